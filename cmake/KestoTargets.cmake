@@ -1,0 +1,49 @@
+# What every target of the project has in common: the language, the warnings, the sanitizers, and two
+# functions so that a folder's CMakeLists.txt names only its files and its neighbours.
+
+set(CMAKE_CXX_STANDARD 23)
+set(CMAKE_CXX_STANDARD_REQUIRED ON)
+set(CMAKE_CXX_EXTENSIONS OFF)
+set(CMAKE_C_STANDARD 11)
+set(CMAKE_EXPORT_COMPILE_COMMANDS ON)
+set(CMAKE_POSITION_INDEPENDENT_CODE ON)
+
+find_program(KESTO_CCACHE ccache)
+if(KESTO_CCACHE)
+  set(CMAKE_CXX_COMPILER_LAUNCHER ${KESTO_CCACHE})
+  set(CMAKE_C_COMPILER_LAUNCHER ${KESTO_CCACHE})
+endif()
+
+# Locks are annotated; clang proves that what they guard is only touched while they are held.
+add_compile_options(-Wall -Wextra -Wpedantic -Werror -Wshadow -Wimplicit-fallthrough
+                    $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
+                    $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety>)
+
+if(KESTO_SANITIZE)
+  add_compile_options(-fsanitize=${KESTO_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
+  add_link_options(-fsanitize=${KESTO_SANITIZE})
+endif()
+if(KESTO_FUZZ)
+  add_compile_options(-fsanitize=fuzzer-no-link)
+endif()
+
+find_package(PkgConfig REQUIRED)
+find_package(Threads REQUIRED)
+find_package(fmt REQUIRED)
+
+# kesto_layer(NAME SOURCES file... USES target...): the static library of one folder below src/.
+function(kesto_layer name)
+  cmake_parse_arguments(PARSE_ARGV 1 arg "" "" "SOURCES;USES;PRIVATE_USES")
+  add_library(kesto_${name} STATIC ${arg_SOURCES})
+  target_include_directories(kesto_${name} PUBLIC ${PROJECT_SOURCE_DIR}/src)
+  target_link_libraries(kesto_${name} PUBLIC ${arg_USES} PRIVATE ${arg_PRIVATE_USES})
+endfunction()
+
+# kesto_test(NAME SOURCES file... USES target...): one GoogleTest program, each of its tests a ctest.
+function(kesto_test name)
+  cmake_parse_arguments(PARSE_ARGV 1 arg "" "" "SOURCES;USES")
+  add_executable(${name} ${arg_SOURCES})
+  target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/tests)
+  target_link_libraries(${name} PRIVATE ${arg_USES} GTest::gmock GTest::gtest_main)
+  gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
+endfunction()

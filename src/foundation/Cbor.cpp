@@ -1,0 +1,401 @@
+#include "foundation/Cbor.h"
+
+#include <algorithm>
+#include <bit>
+#include <cmath>
+#include <cstring>
+#include <limits>
+
+namespace foundation {
+namespace {
+
+enum class Major : std::uint8_t { Unsigned, Negative, Bytes, Text, Array, Map, Tag, Simple };
+
+constexpr std::uint8_t indefiniteLength = 31;
+constexpr char breakByte = '\xFF';
+constexpr std::uint64_t epochDateTag = 1;
+
+// The values of `additional` in a head of major type 7.
+enum Simple : std::uint8_t { False = 20, True = 21, Null = 22, Float16 = 25, Float32 = 26, Float64 = 27 };
+
+template <typename Integer> void appendBigEndian(Integer value, std::string& out)
+{
+    std::array<char, sizeof value> bytes;
+    if constexpr (std::endian::native == std::endian::little)
+        value = std::byteswap(value);
+    std::memcpy(bytes.data(), &value, sizeof value);
+    out.append(bytes.data(), bytes.size());
+}
+
+void appendHead(Major major, std::uint64_t argument, std::string& out)
+{
+    const auto first = [major](unsigned additional) {
+        return static_cast<char>(static_cast<unsigned>(major) << 5 | additional);
+    };
+    if (argument < 24) {
+        out.push_back(first(static_cast<unsigned>(argument)));
+    } else if (argument <= std::numeric_limits<std::uint8_t>::max()) {
+        out.push_back(first(24));
+        out.push_back(static_cast<char>(argument));
+    } else if (argument <= std::numeric_limits<std::uint16_t>::max()) {
+        out.push_back(first(25));
+        appendBigEndian(static_cast<std::uint16_t>(argument), out);
+    } else if (argument <= std::numeric_limits<std::uint32_t>::max()) {
+        out.push_back(first(26));
+        appendBigEndian(static_cast<std::uint32_t>(argument), out);
+    } else {
+        out.push_back(first(27));
+        appendBigEndian(argument, out);
+    }
+}
+
+void appendSimple(Simple simple, std::string& out)
+{
+    out.push_back(static_cast<char>(static_cast<unsigned>(Major::Simple) << 5 | simple));
+}
+
+void appendFloat64(double value, std::string& out)
+{
+    appendSimple(Float64, out);
+    appendBigEndian(std::bit_cast<std::uint64_t>(value), out);
+}
+
+void appendNumber(Number number, std::string& out)
+{
+    switch (number.kind()) {
+    case Number::Kind::Boolean: return appendSimple(number.booleanValue() ? True : False, out);
+    case Number::Kind::Float32:
+        appendSimple(Float32, out);
+        return appendBigEndian(std::bit_cast<std::uint32_t>(static_cast<float>(number.doubleValue())), out);
+    case Number::Kind::Float64: return appendFloat64(number.doubleValue(), out);
+    case Number::Kind::Unsigned64: return appendHead(Major::Unsigned, *number.exactly<std::uint64_t>(), out);
+    case Number::Kind::Signed64: break;
+    }
+    const std::int64_t value = number.int64Value();
+    if (value >= 0)
+        appendHead(Major::Unsigned, static_cast<std::uint64_t>(value), out);
+    else
+        appendHead(Major::Negative, ~static_cast<std::uint64_t>(value), out);
+}
+
+float widenHalf(std::uint16_t half) noexcept // RFC 8949, appendix D
+{
+    const int exponent = half >> 10 & 0x1F;
+    const int mantissa = half & 0x3FF;
+    const float magnitude = exponent == 0 ? std::ldexp(static_cast<float>(mantissa), -24)
+        : exponent != 31                  ? std::ldexp(static_cast<float>(mantissa + 1024), exponent - 25)
+        : mantissa == 0                   ? std::numeric_limits<float>::infinity()
+                                          : std::numeric_limits<float>::quiet_NaN();
+    return (half & 0x8000) != 0 ? -magnitude : magnitude;
+}
+
+} // namespace
+
+std::string_view description(CborError error) noexcept
+{
+    switch (error) {
+    case CborError::Truncated: return "the CBOR item is not complete";
+    case CborError::TrailingBytes: return "bytes follow the CBOR item";
+    case CborError::TooDeep: return "the CBOR item is nested too deep";
+    case CborError::Malformed: return "not well-formed CBOR";
+    case CborError::InvalidUtf8: return "text is not valid UTF-8";
+    case CborError::KeyNotText: return "a map key is not text";
+    case CborError::Unsupported: return "a CBOR item of a type that messages do not have";
+    case CborError::IntegerOutOfRange: return "an integer is out of range";
+    }
+    return "unknown error";
+}
+
+void appendCborInteger(std::uint64_t value, std::string& out)
+{
+    appendHead(Major::Unsigned, value, out);
+}
+
+void appendCborText(std::string_view text, std::string& out)
+{
+    appendHead(Major::Text, text.size(), out);
+    out += text;
+}
+
+void appendCborArrayHead(std::uint64_t count, std::string& out)
+{
+    appendHead(Major::Array, count, out);
+}
+
+void appendCborMapHead(std::uint64_t count, std::string& out)
+{
+    appendHead(Major::Map, count, out);
+}
+
+void appendCbor(const Dictionary& dictionary, std::string& out)
+{
+    appendCborMapHead(dictionary.size(), out);
+    for (const auto& [key, value] : dictionary) {
+        appendCborText(key, out);
+        appendCbor(value, out);
+    }
+}
+
+void appendCbor(const Value& value, std::string& out)
+{
+    switch (value.kind()) {
+    case Value::Kind::Null: return appendCborNull(out);
+    case Value::Kind::Number: return appendNumber(*value.number(), out);
+    case Value::Kind::String: return appendCborText(*value.string(), out);
+    case Value::Kind::Dictionary: return appendCbor(*value.dictionary(), out);
+    case Value::Kind::Array: {
+        const Array array = *value.array();
+        appendCborArrayHead(array.size(), out);
+        for (const Value& element : array)
+            appendCbor(element, out);
+        return;
+    }
+    case Value::Kind::Data: {
+        const Data data = *value.data();
+        appendHead(Major::Bytes, data.bytes.view().size(), out);
+        out += data.bytes.view();
+        return;
+    }
+    case Value::Kind::Date:
+        appendHead(Major::Tag, epochDateTag, out);
+        return appendFloat64(value.date()->secondsSince1970, out);
+    }
+}
+
+// Reads one item after the other. The first error empties the rest, so that every loop ends by itself, and
+// is what `readAll` returns.
+class CborReader {
+public:
+    CborReader(std::string_view bytes, CborDecoder& decoder) : rest_(bytes), decoder_(decoder) { }
+
+    std::expected<Value, CborError> readAll()
+    {
+        Value value = readItem(cborMaximumDepth);
+        if (error_)
+            return std::unexpected(*error_);
+        if (!rest_.empty())
+            return std::unexpected(CborError::TrailingBytes);
+        return value;
+    }
+
+private:
+    struct Head {
+        Major major = Major::Simple;
+        std::uint8_t additional = Null;
+        std::uint64_t argument = 0;
+        [[nodiscard]] bool isIndefinite() const noexcept { return additional == indefiniteLength; }
+    };
+
+    void fail(CborError error) noexcept
+    {
+        if (!error_)
+            error_ = error;
+        rest_ = {};
+    }
+
+    Value refuse(CborError error) noexcept
+    {
+        fail(error);
+        return {};
+    }
+
+    std::string_view take(std::uint64_t count) noexcept
+    {
+        if (rest_.size() < count) {
+            fail(CborError::Truncated);
+            return {};
+        }
+        const std::string_view taken = rest_.substr(0, count);
+        rest_.remove_prefix(taken.size());
+        return taken;
+    }
+
+    template <typename Integer> std::uint64_t takeBigEndian() noexcept
+    {
+        Integer value = 0;
+        if (const std::string_view bytes = take(sizeof value); !bytes.empty())
+            std::memcpy(&value, bytes.data(), sizeof value);
+        return std::endian::native == std::endian::little ? std::byteswap(value) : value;
+    }
+
+    std::uint64_t readArgument(std::uint8_t additional) noexcept
+    {
+        switch (additional) {
+        case 24: return takeBigEndian<std::uint8_t>();
+        case 25: return takeBigEndian<std::uint16_t>();
+        case 26: return takeBigEndian<std::uint32_t>();
+        case 27: return takeBigEndian<std::uint64_t>();
+        case indefiniteLength: return 0;
+        default: break;
+        }
+        if (additional >= 24)
+            fail(CborError::Malformed);
+        return additional;
+    }
+
+    Head readHead() noexcept
+    {
+        const std::string_view initial = take(1);
+        if (initial.empty())
+            return {};
+        const auto byte = static_cast<std::uint8_t>(initial.front());
+        Head head{static_cast<Major>(byte >> 5), static_cast<std::uint8_t>(byte & 0x1F), 0};
+        const bool mayBeIndefinite = head.major >= Major::Bytes && head.major <= Major::Map;
+        if (head.isIndefinite() && !mayBeIndefinite)
+            fail(CborError::Malformed);
+        head.argument = readArgument(head.additional);
+        return error_ ? Head() : head;
+    }
+
+    Value readItem(unsigned depth)
+    {
+        const Head head = readHead();
+        switch (head.major) {
+        case Major::Unsigned:
+            return std::in_range<std::int64_t>(head.argument) ? Value(static_cast<std::int64_t>(head.argument))
+                                                              : Value(head.argument);
+        case Major::Negative:
+            return std::in_range<std::int64_t>(head.argument) ? Value(-1 - static_cast<std::int64_t>(head.argument))
+                                                              : refuse(CborError::IntegerOutOfRange);
+        case Major::Bytes: return Data{String(readBytes(head))};
+        case Major::Text: return String(readText(head));
+        case Major::Array: return depth == 0 ? refuse(CborError::TooDeep) : readArray(head, depth - 1);
+        case Major::Map: return depth == 0 ? refuse(CborError::TooDeep) : readMap(head, depth - 1);
+        case Major::Tag: return readTagged(head);
+        case Major::Simple: return simpleValue(head);
+        }
+        return refuse(CborError::Malformed);
+    }
+
+    Value simpleValue(const Head& head) noexcept
+    {
+        switch (head.additional) {
+        case False: return false;
+        case True: return true;
+        case Null: return {};
+        case Float16: return widenHalf(static_cast<std::uint16_t>(head.argument));
+        case Float32: return std::bit_cast<float>(static_cast<std::uint32_t>(head.argument));
+        case Float64: return std::bit_cast<double>(head.argument);
+        default: break;
+        }
+        const bool wellFormed = head.additional != 24 || head.argument >= 32;
+        return refuse(wellFormed ? CborError::Unsupported : CborError::Malformed);
+    }
+
+    // Inside an indefinite length: whether the break is next, which is then taken.
+    bool takeBreak() noexcept
+    {
+        if (!rest_.starts_with(breakByte))
+            return false;
+        rest_.remove_prefix(1);
+        return true;
+    }
+
+    // Calls `readElement` as often as the container says, or until its break.
+    template <typename ReadElement> void readElements(const Head& head, ReadElement readElement)
+    {
+        for (std::uint64_t index = 0; head.isIndefinite() ? !takeBreak() : index < head.argument; ++index) {
+            readElement();
+            if (error_)
+                return;
+        }
+    }
+
+    // Those of an indefinite length are gathered in `chunks_`, which lasts until the next string.
+    std::string_view readBytes(const Head& head)
+    {
+        if (!head.isIndefinite())
+            return take(head.argument);
+        chunks_.clear();
+        readElements(head, [&] {
+            const Head chunk = readHead();
+            if (chunk.major != head.major || chunk.isIndefinite())
+                return fail(CborError::Malformed);
+            const std::string_view bytes = take(chunk.argument);
+            if (head.major == Major::Text && !isValidUtf8(bytes)) // each chunk is text by itself
+                return fail(CborError::InvalidUtf8);
+            chunks_ += bytes;
+        });
+        return chunks_;
+    }
+
+    std::string_view readText(const Head& head)
+    {
+        const std::string_view text = readBytes(head);
+        if (!isValidUtf8(text))
+            fail(CborError::InvalidUtf8);
+        return text;
+    }
+
+    String readKey()
+    {
+        const Head head = readHead();
+        if (head.major != Major::Text) {
+            fail(CborError::KeyNotText);
+            return {};
+        }
+        return decoder_.internKey(readText(head));
+    }
+
+    // Room for what a container claims to hold, as long as the claim is modest: it is not to be trusted.
+    [[nodiscard]] static std::size_t plausibleCount(const Head& head) noexcept
+    {
+        constexpr std::uint64_t mostReserved = 128;
+        return static_cast<std::size_t>(std::min(head.argument, mostReserved));
+    }
+
+    Value readArray(const Head& head, unsigned depth)
+    {
+        std::vector<Value> values;
+        values.reserve(plausibleCount(head));
+        readElements(head, [&] { values.push_back(readItem(depth)); });
+        return Array(std::move(values));
+    }
+
+    Value readMap(const Head& head, unsigned depth)
+    {
+        Dictionary::Entries entries;
+        entries.reserve(plausibleCount(head));
+        readElements(head, [&] {
+            String key = readKey();
+            entries.push_back({std::move(key), readItem(depth)});
+        });
+        return Dictionary(std::move(entries));
+    }
+
+    Value readTagged(const Head& head)
+    {
+        if (head.argument != epochDateTag)
+            return refuse(CborError::Unsupported);
+        const Value seconds = readItem(0);
+        const auto number = seconds.number();
+        if (!number || number->kind() == Number::Kind::Boolean)
+            return refuse(CborError::Malformed);
+        return Date{number->doubleValue()};
+    }
+
+    std::string_view rest_;
+    CborDecoder& decoder_;
+    std::optional<CborError> error_;
+    std::string chunks_;
+};
+
+std::expected<Value, CborError> CborDecoder::decode(std::string_view bytes)
+{
+    return CborReader(bytes, *this).readAll();
+}
+
+String CborDecoder::internKey(std::string_view key)
+{
+    if (key.empty() || key.size() > longestRememberedKey)
+        return String(key);
+    std::size_t hash = key.size();
+    for (const char character : key)
+        hash = hash * 31 + static_cast<std::uint8_t>(character);
+    String& remembered = keys_[(hash ^ hash >> 8) % keys_.size()];
+    if (remembered.view() != key)
+        remembered = String(key);
+    return remembered;
+}
+
+} // namespace foundation

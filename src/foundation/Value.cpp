@@ -1,0 +1,329 @@
+#include "foundation/Value.h"
+
+#include "foundation/Json.h"
+
+#include <algorithm>
+#include <bit>
+#include <charconv>
+#include <cmath>
+#include <numeric>
+
+namespace foundation {
+
+// --- Value
+
+Value::Value(String text) noexcept : kind_(Kind::String), object_(text.object_.leak()) { }
+Value::Value(Array array) noexcept : kind_(Kind::Array), object_(array.object_.leak()) { }
+Value::Value(Dictionary dictionary) noexcept : kind_(Kind::Dictionary), object_(dictionary.object_.leak()) { }
+Value::Value(Data data) noexcept : kind_(Kind::Data), object_(data.bytes.object_.leak()) { }
+Value::Value(Date date) noexcept : kind_(Kind::Date), date_(date.secondsSince1970) { }
+
+bool Value::isShared() const noexcept
+{
+    return kind_ >= Kind::String && kind_ <= Kind::Data && object_ != nullptr;
+}
+
+template <typename Object> const Object* Value::objectAs() const noexcept
+{
+    return static_cast<const Object*>(object_);
+}
+
+template <typename Object> Reference<Object> Value::shareAs() const noexcept
+{
+    if (object_ == nullptr)
+        return {};
+    object_->retain();
+    return Reference<Object>::adopt(objectAs<Object>());
+}
+
+std::string_view Value::bytesUnchecked() const noexcept
+{
+    return object_ == nullptr ? std::string_view() : objectAs<StringObject>()->view();
+}
+
+Value::Value(const Value& other) noexcept : kind_(other.kind_), numberKind_(other.numberKind_), scalar_(other.scalar_)
+{
+    if (isShared())
+        object_->retain();
+}
+
+Value::Value(Value&& other) noexcept
+    : kind_(std::exchange(other.kind_, Kind::Null)),
+      numberKind_(other.numberKind_),
+      scalar_(std::exchange(other.scalar_, 0))
+{
+}
+
+Value& Value::operator=(Value other) noexcept
+{
+    std::swap(kind_, other.kind_);
+    std::swap(numberKind_, other.numberKind_);
+    std::swap(scalar_, other.scalar_);
+    return *this;
+}
+
+Value::~Value()
+{
+    if (!isShared() || !object_->release())
+        return;
+    switch (kind_) {
+    case Kind::Array: ArrayObject::destroy(objectAs<ArrayObject>()); break;
+    case Kind::Dictionary: DictionaryObject::destroy(objectAs<DictionaryObject>()); break;
+    default: StringObject::destroy(objectAs<StringObject>()); break;
+    }
+}
+
+Number Value::numberUnchecked() const noexcept
+{
+    Number number;
+    number.kind_ = numberKind_;
+    number.unsigned_ = scalar_;
+    if (numberKind_ == Number::Kind::Float32)
+        number.float32_ = std::bit_cast<float>(static_cast<std::uint32_t>(scalar_));
+    return number;
+}
+
+std::optional<Number> Value::number() const noexcept
+{
+    if (kind_ != Kind::Number)
+        return std::nullopt;
+    return numberUnchecked();
+}
+
+std::optional<String> Value::string() const noexcept
+{
+    if (kind_ != Kind::String)
+        return std::nullopt;
+    return String(shareAs<StringObject>());
+}
+
+std::optional<Array> Value::array() const noexcept
+{
+    if (kind_ != Kind::Array)
+        return std::nullopt;
+    return Array(shareAs<ArrayObject>());
+}
+
+std::optional<Dictionary> Value::dictionary() const noexcept
+{
+    if (kind_ != Kind::Dictionary)
+        return std::nullopt;
+    return Dictionary(shareAs<DictionaryObject>());
+}
+
+std::optional<Data> Value::data() const noexcept
+{
+    if (kind_ != Kind::Data)
+        return std::nullopt;
+    return Data{String(shareAs<StringObject>())};
+}
+
+std::optional<Date> Value::date() const noexcept
+{
+    if (kind_ != Kind::Date)
+        return std::nullopt;
+    return Date{date_};
+}
+
+namespace {
+
+std::string_view withoutLeading(std::string_view text, std::string_view characters) noexcept
+{
+    return text.substr(std::min(text.find_first_not_of(characters), text.size()));
+}
+
+constexpr std::string_view blanks = " \t\n\v\f\r";
+
+double leadingNumber(std::string_view text) noexcept
+{
+    text = withoutLeading(text, blanks);
+    if (text.starts_with('+'))
+        text.remove_prefix(1);
+    double number = 0;
+    std::from_chars(text.data(), text.data() + text.size(), number);
+    return std::isfinite(number) ? number : 0; // "inf" and "nan" are words, not numbers
+}
+
+bool leadingTruth(std::string_view text) noexcept
+{
+    text = withoutLeading(text, blanks);
+    if (text.starts_with('+') || text.starts_with('-'))
+        text.remove_prefix(1);
+    text = withoutLeading(text, "0");
+    return !text.empty() && std::string_view("YyTt123456789").contains(text.front());
+}
+
+} // namespace
+
+double Value::asDouble() const noexcept
+{
+    if (kind_ == Kind::Number)
+        return numberUnchecked().doubleValue();
+    return kind_ == Kind::String ? leadingNumber(bytesUnchecked()) : 0;
+}
+
+bool Value::asBoolean() const noexcept
+{
+    if (kind_ == Kind::Number)
+        return numberUnchecked().booleanValue();
+    return kind_ == Kind::String && leadingTruth(bytesUnchecked());
+}
+
+std::string Value::text() const
+{
+    std::string text;
+    appendText(text);
+    return text;
+}
+
+void Value::appendText(std::string& out) const
+{
+    switch (kind_) {
+    case Kind::Null: out += "(null)"; break;
+    case Kind::Number: numberUnchecked().appendText(out); break;
+    case Kind::String: out += bytesUnchecked(); break;
+    default: appendJsonText(*this, out); break;
+    }
+}
+
+bool operator==(const Value& left, const Value& right) noexcept
+{
+    if (left.kind_ != right.kind_)
+        return false;
+    switch (left.kind_) {
+    case Value::Kind::Null: return true;
+    case Value::Kind::Number: return left.numberUnchecked() == right.numberUnchecked();
+    case Value::Kind::Date: return left.date_ == right.date_;
+    case Value::Kind::Array: return *left.array() == *right.array();
+    case Value::Kind::Dictionary: return *left.dictionary() == *right.dictionary();
+    default: return left.object_ == right.object_ || left.bytesUnchecked() == right.bytesUnchecked();
+    }
+}
+
+// --- Array
+
+Array::Array(std::vector<Value> values) : object_(Reference<ArrayObject>::adopt(new ArrayObject(std::move(values)))) { }
+
+bool operator==(const Array& left, const Array& right) noexcept
+{
+    return std::ranges::equal(left.values(), right.values());
+}
+
+// --- Dictionary
+
+DictionaryObject::DictionaryObject(std::vector<DictionaryEntry> given) : entries_(std::move(given))
+{
+    // Up to here comparing the keys one by one beats any index.
+    constexpr std::size_t mostUnindexed = 16;
+    if (entries_.size() <= mostUnindexed)
+        foldRepetitions();
+    else
+        indexAndFoldRepetitions();
+}
+
+const Value* DictionaryObject::find(std::string_view key) const noexcept
+{
+    if (byKey_.empty()) {
+        const auto found = std::ranges::find(entries_, key, [](const auto& entry) { return entry.key.view(); });
+        return found == entries_.end() ? nullptr : &found->value;
+    }
+    const auto found = std::ranges::lower_bound(byKey_, key, {}, [this](auto position) { return keyAt(position); });
+    return found == byKey_.end() || keyAt(*found) != key ? nullptr : &entries_[*found].value;
+}
+
+void DictionaryObject::foldRepetitions()
+{
+    auto kept = entries_.begin();
+    for (auto entry = entries_.begin(); entry != entries_.end(); ++entry) {
+        const auto earlier =
+            std::find_if(entries_.begin(), kept, [&](const auto& other) { return other.key == entry->key; });
+        if (earlier != kept)
+            earlier->value = std::move(entry->value);
+        else if (kept++ != entry)
+            *std::prev(kept) = std::move(*entry);
+    }
+    entries_.erase(kept, entries_.end());
+}
+
+void DictionaryObject::indexKeys()
+{
+    byKey_.resize(entries_.size());
+    std::iota(byKey_.begin(), byKey_.end(), 0U);
+    std::ranges::sort(byKey_, {}, [this](auto position) { return std::pair(keyAt(position), position); });
+}
+
+void DictionaryObject::indexAndFoldRepetitions()
+{
+    indexKeys();
+    std::vector<bool> repeats(entries_.size());
+    bool any = false;
+    for (std::size_t first = 0, next = 1; next < byKey_.size(); ++next) {
+        if (keyAt(byKey_[next]) != keyAt(byKey_[first])) {
+            first = next;
+            continue;
+        }
+        entries_[byKey_[first]].value = std::move(entries_[byKey_[next]].value);
+        any = repeats[byKey_[next]] = true;
+    }
+    if (!any)
+        return;
+    std::vector<DictionaryEntry> distinct;
+    for (std::size_t position = 0; position < entries_.size(); ++position)
+        if (!repeats[position])
+            distinct.push_back(std::move(entries_[position]));
+    entries_ = std::move(distinct);
+    indexKeys();
+}
+
+Dictionary::Dictionary(Entries entries)
+    : object_(Reference<DictionaryObject>::adopt(new DictionaryObject(std::move(entries))))
+{
+}
+
+Dictionary Dictionary::with(String key, Value value) const
+{
+    Entries changed;
+    changed.reserve(size() + 1);
+    changed.assign(begin(), end());
+    changed.push_back({std::move(key), std::move(value)});
+    return changed;
+}
+
+Dictionary Dictionary::without(std::string_view key) const
+{
+    if (!contains(key))
+        return *this;
+    Entries kept;
+    kept.reserve(size());
+    std::ranges::copy_if(*this, std::back_inserter(kept), [key](const Entry& entry) { return entry.key != key; });
+    return kept;
+}
+
+Dictionary Dictionary::mergedWith(const Dictionary& other) const
+{
+    Entries all;
+    all.reserve(size() + other.size());
+    all.assign(begin(), end());
+    all.insert(all.end(), other.begin(), other.end());
+    return all;
+}
+
+bool Dictionary::isEqualIgnoring(const Dictionary& other, std::span<const std::string_view> keys) const noexcept
+{
+    const auto counts = [keys](const Entry& entry) { return std::ranges::find(keys, entry.key.view()) == keys.end(); };
+    const auto theirs = other.entries();
+    std::size_t counted = 0;
+    for (std::size_t position = 0; const Entry& entry : entries()) {
+        const std::size_t here = position++;
+        if (!counts(entry))
+            continue;
+        ++counted;
+        const bool samePlace = here < theirs.size() && theirs[here].key == entry.key;
+        const Value* value = samePlace ? &theirs[here].value : other.find(entry.key);
+        if (value == nullptr || *value != entry.value)
+            return false;
+    }
+    return counted == static_cast<std::size_t>(std::ranges::count_if(theirs, counts));
+}
+
+} // namespace foundation

@@ -1,0 +1,221 @@
+// The one data type of messages, configurations and preferences: null, number, string, array,
+// dictionary, and the data and dates that property lists have.
+//
+// A value is immutable, 16 bytes, and cheap to copy: strings, arrays and dictionaries are shared. That
+// makes it safe to hand a payload to the store's thread while the session keeps it too.
+#pragma once
+
+#include "foundation/Number.h"
+#include "foundation/Reference.h"
+#include "foundation/String.h"
+
+#include <cstdint>
+#include <initializer_list>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace foundation {
+
+class Array;
+class Dictionary;
+
+// Bytes that are not text. Any thread.
+struct Data {
+    String bytes;
+    friend bool operator==(const Data&, const Data&) = default;
+};
+
+// A point in time, in seconds since 1970 UTC.
+struct Date {
+    double secondsSince1970 = 0;
+    friend bool operator==(const Date&, const Date&) = default;
+};
+
+// Any thread; distinct copies may be used from different threads at once.
+class Value {
+public:
+    enum class Kind : std::uint8_t { Null, Number, String, Array, Dictionary, Data, Date };
+
+    constexpr Value() noexcept = default;
+    constexpr Value(Number number) noexcept : kind_(Kind::Number), numberKind_(number.kind_), scalar_(number.unsigned_)
+    {
+        if (number.kind_ == Number::Kind::Float32)
+            scalar_ &= 0xFFFFFFFF;
+    }
+    constexpr Value(std::integral auto number) noexcept : Value(Number(number)) { }
+    constexpr Value(std::floating_point auto number) noexcept : Value(Number(number)) { }
+    Value(String text) noexcept;
+    Value(std::string_view text) : Value(String(text)) { }
+    Value(const std::string& text) : Value(String(text)) { }
+    Value(const char* text) : Value(String(text)) { }
+    Value(Array array) noexcept;
+    Value(Dictionary dictionary) noexcept;
+    Value(Data data) noexcept;
+    Value(Date date) noexcept;
+
+    Value(const Value& other) noexcept;
+    Value(Value&& other) noexcept;
+    Value& operator=(Value other) noexcept;
+    ~Value();
+
+    [[nodiscard]] Kind kind() const noexcept { return kind_; }
+    [[nodiscard]] bool isNull() const noexcept { return kind_ == Kind::Null; }
+
+    // The value as that type, or nothing when it is of another kind.
+    [[nodiscard]] std::optional<Number> number() const noexcept;
+    [[nodiscard]] std::optional<String> string() const noexcept;
+    [[nodiscard]] std::optional<Array> array() const noexcept;
+    [[nodiscard]] std::optional<Dictionary> dictionary() const noexcept;
+    [[nodiscard]] std::optional<Data> data() const noexcept;
+    [[nodiscard]] std::optional<Date> date() const noexcept;
+
+    // What the value counts as where a number is asked for: text is read as its leading number, anything
+    // that is neither number nor text as 0.
+    [[nodiscard]] double asDouble() const noexcept;
+    // As a truth value: a number that is not 0, or text that begins with Y, y, T, t or a number that is not
+    // 0 (after blanks, a sign and zeros); anything else is false.
+    [[nodiscard]] bool asBoolean() const noexcept;
+
+    // A string as it is, a number's decimal text, the compact JSON of an array or a dictionary, "(null)"
+    // for null, the base64 of data and the ISO 8601 text of a date.
+    [[nodiscard]] std::string text() const;
+    void appendText(std::string& out) const;
+
+    // By content; numbers by value, whatever their kinds.
+    friend bool operator==(const Value& left, const Value& right) noexcept;
+
+private:
+    [[nodiscard]] bool isShared() const noexcept;
+    [[nodiscard]] Number numberUnchecked() const noexcept;
+    [[nodiscard]] std::string_view bytesUnchecked() const noexcept;
+    template <typename Object> [[nodiscard]] const Object* objectAs() const noexcept;
+    template <typename Object> [[nodiscard]] Reference<Object> shareAs() const noexcept;
+
+    Kind kind_ = Kind::Null;
+    Number::Kind numberKind_ = Number::Kind::Signed64;
+    union {
+        std::uint64_t scalar_ = 0;
+        double date_;
+        const ReferenceCounted* object_; // of strings, data, arrays and dictionaries; null is the empty one
+    };
+};
+
+class ArrayObject : public ReferenceCounted {
+public:
+    explicit ArrayObject(std::vector<Value> given) noexcept : values(std::move(given)) { }
+    static void destroy(const ArrayObject* object) noexcept { delete object; }
+
+    const std::vector<Value> values;
+};
+
+// An immutable, shared list of values. Any thread.
+class Array {
+public:
+    Array() noexcept = default;
+    Array(std::vector<Value> values);
+    Array(std::initializer_list<Value> values) : Array(std::vector<Value>(values)) { }
+
+    [[nodiscard]] std::span<const Value> values() const noexcept
+    {
+        return object_ ? std::span<const Value>(object_->values) : std::span<const Value>();
+    }
+    [[nodiscard]] std::size_t size() const noexcept { return values().size(); }
+    [[nodiscard]] bool empty() const noexcept { return values().empty(); }
+    const Value& operator[](std::size_t index) const noexcept { return values()[index]; }
+    [[nodiscard]] auto begin() const noexcept { return values().begin(); }
+    [[nodiscard]] auto end() const noexcept { return values().end(); }
+
+    friend bool operator==(const Array& left, const Array& right) noexcept;
+
+private:
+    friend class Value;
+    explicit Array(Reference<ArrayObject> object) noexcept : object_(std::move(object)) { }
+    Reference<ArrayObject> object_;
+};
+
+// One entry of a dictionary.
+struct DictionaryEntry {
+    String key;
+    Value value;
+};
+
+// Entries in order of insertion and, where they are many, their positions in the order of their keys. A
+// sorted index rather than a hash table: no choice of keys, however hostile, makes it slow.
+class DictionaryObject : public ReferenceCounted {
+public:
+    explicit DictionaryObject(std::vector<DictionaryEntry> given);
+    static void destroy(const DictionaryObject* object) noexcept { delete object; }
+
+    [[nodiscard]] std::span<const DictionaryEntry> entries() const noexcept { return entries_; }
+    [[nodiscard]] const Value* find(std::string_view key) const noexcept;
+
+private:
+    [[nodiscard]] std::string_view keyAt(std::uint32_t position) const noexcept { return entries_[position].key; }
+    void foldRepetitions();
+    void indexAndFoldRepetitions();
+    void indexKeys();
+
+    std::vector<DictionaryEntry> entries_;
+    std::vector<std::uint32_t> byKey_; // empty where there are few entries
+};
+
+// An immutable, shared dictionary in the order of insertion. Any thread.
+//
+// There is one way to make one: from a list of entries, in which an entry whose key stands earlier
+// replaces that entry's value and takes its place. Changing is making a new one; whoever gathers many entries
+// gathers them in a vector.
+class Dictionary {
+public:
+    using Entry = DictionaryEntry;
+    using Entries = std::vector<Entry>;
+
+    Dictionary() noexcept = default;
+    Dictionary(Entries entries);
+    Dictionary(std::initializer_list<Entry> entries) : Dictionary(Entries(entries)) { }
+
+    [[nodiscard]] std::span<const Entry> entries() const noexcept
+    {
+        return object_ ? object_->entries() : std::span<const Entry>();
+    }
+    [[nodiscard]] std::size_t size() const noexcept { return entries().size(); }
+    [[nodiscard]] bool empty() const noexcept { return entries().empty(); }
+    [[nodiscard]] auto begin() const noexcept { return entries().begin(); }
+    [[nodiscard]] auto end() const noexcept { return entries().end(); }
+
+    // The value under the key, or null pointer. Valid as long as a copy of this dictionary lives.
+    [[nodiscard]] const Value* find(std::string_view key) const noexcept
+    {
+        return object_ ? object_->find(key) : nullptr;
+    }
+    [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
+
+    // Copies with one entry set, with one entry removed, and with all entries of another set.
+    [[nodiscard]] Dictionary with(String key, Value value) const;
+    [[nodiscard]] Dictionary without(std::string_view key) const;
+    [[nodiscard]] Dictionary mergedWith(const Dictionary& other) const;
+
+    // Whether both are one object, which makes them equal at no cost.
+    [[nodiscard]] bool isSameObject(const Dictionary& other) const noexcept
+    {
+        return object_.get() == other.object_.get();
+    }
+    // Equal but for the entries under these keys, which count on neither side.
+    [[nodiscard]] bool isEqualIgnoring(const Dictionary& other, std::span<const std::string_view> keys) const noexcept;
+
+    // The same keys with equal values, in any order.
+    friend bool operator==(const Dictionary& left, const Dictionary& right) noexcept
+    {
+        return left.isSameObject(right) || left.isEqualIgnoring(right, {});
+    }
+
+private:
+    friend class Value;
+    explicit Dictionary(Reference<DictionaryObject> object) noexcept : object_(std::move(object)) { }
+    Reference<DictionaryObject> object_;
+};
+
+} // namespace foundation

@@ -1,0 +1,87 @@
+#include "platform/Absent.h"
+
+namespace platform {
+
+Notifications::Registration AbsentNotifications::registerNotification(std::string_view, std::shared_ptr<WorkQueue>,
+                                                                      Handler)
+{
+    return {.status = unavailable, .token = 0};
+}
+
+std::expected<std::uint64_t, NotificationStatus> AbsentNotifications::state(std::int32_t) const
+{
+    return std::unexpected(unavailable);
+}
+
+void AbsentTraceMarkers::emit(std::uint32_t, const std::array<std::uint64_t, 4>&) { }
+
+ReportingChannels::FoundChannels AbsentReportingChannels::copyChannelsInGroup(std::optional<std::string_view>,
+                                                                              std::optional<std::string_view>)
+{
+    return {};
+}
+
+std::size_t AbsentReportingChannels::channelCount(const ChannelSet&) const
+{
+    return 0;
+}
+
+ReportingChannels::Subscribed AbsentReportingChannels::createSubscription(const ChannelSet&)
+{
+    return {.subscription = nullptr, .channels = nullptr, .error = unavailable};
+}
+
+std::expected<ReportingSample, ReportingChannelError> AbsentReportingChannels::createSamples(const Subscription&,
+                                                                                             const ChannelSet&)
+{
+    return std::unexpected(unavailable);
+}
+
+std::expected<ReportingSample, ReportingChannelError> AbsentReportingChannels::createDifference(const ReportingSample&,
+                                                                                                const ReportingSample&)
+{
+    return std::unexpected(unavailable);
+}
+
+namespace {
+
+class AbsentBugCaptureReporter final : public BugCaptureReporter {
+public:
+    foundation::Dictionary makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
+                                         std::string_view subtypeContext, std::string_view detectedProcess,
+                                         const std::optional<foundation::Value>& triggerThresholdValues) override
+    {
+        foundation::Dictionary signature{{"domain", domain},
+                                         {"type", type},
+                                         {"subType", subType},
+                                         {"subtypeContext", subtypeContext},
+                                         {"detectedProcess", detectedProcess}};
+        return triggerThresholdValues ? signature.with("triggerThresholdValues", *triggerThresholdValues) : signature;
+    }
+
+    void requestSnapshot(foundation::Dictionary, double, const std::optional<foundation::Value>&,
+                         const std::optional<foundation::Value>&, Reply reply) override
+    {
+        reply({{"success", false}, {"reason", "this device has no bug-capture service"}});
+    }
+};
+
+} // namespace
+
+std::unique_ptr<BugCaptureReporter> AbsentBugCapture::makeReporter()
+{
+    return std::make_unique<AbsentBugCaptureReporter>();
+}
+
+std::unique_ptr<KernelTraceSession> AbsentKernelTrace::createTraceSession()
+{
+    return nullptr;
+}
+
+std::unique_ptr<PerformanceFile> AbsentPerformanceWriter::open(const std::filesystem::path&, std::string_view,
+                                                               std::uint32_t)
+{
+    return nullptr;
+}
+
+} // namespace platform

@@ -1,0 +1,76 @@
+// Inter-process connections, as the service sees them: a listener with a delegate, and connections that
+// deliver calls and carry replies back.
+//
+// A connection knows nothing of the operations: a call is an array of values, checked by whoever is
+// given it. All handlers of one connection run on one connection thread, in order: calls, then at most
+// one interruption, then one invalidation, after which nothing follows.
+#pragma once
+
+#include "foundation/Value.h"
+
+#include <cstdint>
+#include <expected>
+#include <functional>
+#include <memory>
+#include <string>
+#include <sys/types.h>
+
+namespace platform {
+
+class Connection {
+public:
+    // What a call handler answers to a call that breaks the protocol: the words that the log shows.
+    // The connection then ends.
+    struct Violation {
+        std::string reason;
+    };
+    // One call. Whoever works on it keeps `credit` until it is answered: while a client's unanswered calls
+    // are too many or too large, the connection reads no more from it.
+    struct Call {
+        foundation::Array frame;
+        std::shared_ptr<void> credit;
+    };
+    using CallHandler = std::move_only_function<std::expected<void, Violation>(Call call)>;
+    using EndHandler = std::move_only_function<void()>;
+
+    virtual ~Connection() = default;
+
+    // Who is at the other end, as the kernel told at acceptance. Any thread.
+    [[nodiscard]] virtual std::int32_t processIdentifier() const = 0;
+    // The peer in words, for the log. Any thread.
+    [[nodiscard]] virtual std::string description() const = 0;
+
+    // Before `resume`: what is called for each frame, when the connection broke, and when it is over (also
+    // after it broke, and when the peer closed it cleanly).
+    virtual void setCallHandler(CallHandler handler) = 0;
+    virtual void setInterruptionHandler(EndHandler handler) = 0;
+    virtual void setInvalidationHandler(EndHandler handler) = 0;
+
+    // Begins to read.
+    virtual void resume() = 0;
+
+    // Queues one frame, an encoded CBOR item, to the peer. Never blocks; what is sent to a connection that
+    // is over is dropped. Frames sent on the server queue leave after the turn, once everything the turn
+    // stored is kept. Any thread.
+    virtual void send(std::string frame) = 0;
+};
+
+// Decides on new connections. Called on a connection thread.
+class ConnectionListenerDelegate {
+public:
+    virtual ~ConnectionListenerDelegate() = default;
+    // True accepts; the delegate has then installed the handlers and resumed the connection.
+    virtual bool shouldAcceptNewConnection(const std::shared_ptr<Connection>& connection) = 0;
+};
+
+// The listener of the name under which the process was launched. One a process.
+class ConnectionListener {
+public:
+    virtual ~ConnectionListener() = default;
+    virtual void setDelegate(ConnectionListenerDelegate& delegate) = 0; // must outlive the listener's run
+    // Accepts connections; keeps the calling thread until `stop` (which only tests call).
+    virtual void resume() = 0;
+    virtual void stop() = 0;
+};
+
+} // namespace platform

@@ -1,0 +1,45 @@
+// The kernel event trace service: sessions that deliver the kernel's trace events of a range of codes.
+#pragma once
+
+#include "platform/WorkQueue.h"
+
+#include <array>
+#include <cstdint>
+#include <functional>
+#include <memory>
+
+namespace platform {
+
+// One event as the kernel recorded it.
+struct KernelTraceEvent {
+    std::uint64_t timestamp = 0; // in the session's own unit; `timestampToNanoseconds` converts
+    std::uint64_t thread = 0;
+    std::uint32_t code = 0;
+    std::uint32_t cpu = 0;
+    std::array<std::uint64_t, 4> arguments{};
+};
+
+// One trace session. Its handlers run on the queue that `start` was given, in the order of time.
+class KernelTraceSession {
+public:
+    virtual ~KernelTraceSession() = default;
+    // Runs once, after the session ended and everything was delivered.
+    virtual void setCompletionHandler(std::function<void()> handler) = 0;
+    virtual void enableWallTimes(bool enabled) = 0;
+    // 0 or an error number, here and in `start`.
+    virtual int filterEventRange(std::uint32_t firstCode, std::uint32_t lastCode,
+                                 std::function<void(const KernelTraceEvent&)> handler) = 0;
+    virtual int start(std::shared_ptr<WorkQueue> queue) = 0;
+    virtual void end() = 0;
+    [[nodiscard]] virtual std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const = 0;
+};
+
+// Any thread.
+class KernelTrace {
+public:
+    virtual ~KernelTrace() = default;
+    // Null on a system that cannot trace; the "Tracing" feature then counts as off.
+    [[nodiscard]] virtual std::unique_ptr<KernelTraceSession> createTraceSession() = 0;
+};
+
+} // namespace platform

@@ -1,0 +1,100 @@
+// Log categories and the statements that write to them.
+//
+// A statement below its category's threshold costs a load and a branch: nothing of it is evaluated.
+// Above it, the line starts with the source file's name, right-aligned, and the line number, so that a
+// reader finds the statement; the sink decides where the line goes.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <fmt/core.h>
+#include <string_view>
+
+namespace platform {
+
+// From the most to the least important. A threshold lets through its own level and everything before it.
+enum class LogLevel : std::uint8_t { Error, Default, Info, Debug };
+
+[[nodiscard]] std::string_view name(LogLevel level) noexcept;
+
+// One tag of the subsystem. Constant-initialised, so that it can be a global that costs nothing at start;
+// lives as long as the process. Any thread.
+class LogCategory {
+public:
+    constexpr LogCategory(std::string_view subsystem, std::string_view tag) noexcept : subsystem_(subsystem), tag_(tag)
+    {
+    }
+    LogCategory(const LogCategory&) = delete;
+    LogCategory& operator=(const LogCategory&) = delete;
+
+    [[nodiscard]] std::string_view subsystem() const noexcept { return subsystem_; }
+    [[nodiscard]] std::string_view tag() const noexcept { return tag_; }
+
+    [[nodiscard]] bool isEnabled(LogLevel level) noexcept
+    {
+        const std::uint8_t threshold = threshold_.load(std::memory_order_relaxed);
+        return static_cast<std::uint8_t>(level) <= threshold
+            && (threshold != unresolved || isEnabledOnceResolved(level));
+    }
+
+    // Forgets the threshold, so that the next statement asks the current platform's log. For its installation.
+    void forgetThreshold() noexcept { threshold_.store(unresolved, std::memory_order_relaxed); }
+
+private:
+    bool isEnabledOnceResolved(LogLevel level) noexcept;
+
+    static constexpr std::uint8_t unresolved = 255; // lets everything through to the slow path
+
+    std::string_view subsystem_;
+    std::string_view tag_;
+    std::atomic<std::uint8_t> threshold_{unresolved};
+};
+
+// Where a log statement stands.
+struct LogLocation {
+    std::string_view file; // without folder and extension
+    int line = 0;
+};
+
+struct LogRecord {
+    const LogCategory& category;
+    LogLevel level;
+    LogLocation location;
+    std::string_view message; // without the prefix
+};
+
+// The platform's log. Its functions are called from any thread, several at once.
+class Log {
+public:
+    virtual ~Log() = default;
+    [[nodiscard]] virtual LogLevel threshold(const LogCategory& category) const = 0;
+    virtual void write(const LogRecord& record) = 0;
+};
+
+// The prefix that every line starts with: the file right-aligned in 25 columns, the line left-aligned in 5.
+[[nodiscard]] std::string logPrefix(const LogLocation& location);
+
+// Formats the message and hands it to the current platform's log.
+void writeLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,
+              fmt::format_args arguments);
+
+// "/a/b/Name.cpp" is "Name".
+consteval std::string_view baseName(std::string_view path)
+{
+    if (const auto slash = path.rfind('/'); slash != std::string_view::npos)
+        path.remove_prefix(slash + 1);
+    return path.substr(0, path.rfind('.'));
+}
+
+} // namespace platform
+
+// KESTO_LOG(category accessor's result, level, format of {fmt}, arguments...)
+#define KESTO_LOG(logCategory, logLevel, format, ...)                                                        \
+    do {                                                                                                     \
+        ::platform::LogCategory& kestoLogCategory = (logCategory);                                           \
+        if (kestoLogCategory.isEnabled(::platform::LogLevel::logLevel)) [[unlikely]] {                       \
+            constexpr std::string_view kestoLogFile = ::platform::baseName(__FILE__);                        \
+            ::platform::writeLog(kestoLogCategory, ::platform::LogLevel::logLevel, {kestoLogFile, __LINE__}, \
+                                 FMT_STRING(format), ::fmt::make_format_args(__VA_ARGS__));                  \
+        }                                                                                                    \
+    } while (false)

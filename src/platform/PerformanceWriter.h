@@ -1,0 +1,29 @@
+// The performance-data writer: one file of named measurements.
+#pragma once
+
+#include <cstdint>
+#include <filesystem>
+#include <memory>
+#include <string_view>
+
+namespace platform {
+
+enum class PerformanceUnit : std::uint8_t { Nanoseconds };
+
+// An open file; destroying it flushes and closes.
+class PerformanceFile {
+public:
+    virtual ~PerformanceFile() = default;
+    virtual void write(std::string_view name, double value, PerformanceUnit unit) = 0;
+};
+
+// Any thread.
+class PerformanceWriter {
+public:
+    virtual ~PerformanceWriter() = default;
+    // Null when the file cannot be opened.
+    [[nodiscard]] virtual std::unique_ptr<PerformanceFile> open(const std::filesystem::path& path,
+                                                                std::string_view project, std::uint32_t version) = 0;
+};
+
+} // namespace platform

@@ -1,0 +1,61 @@
+#include "platform/Platform.h"
+
+#include <cassert>
+#include <mutex>
+#include <optional>
+#include <vector>
+
+namespace platform {
+namespace {
+
+std::optional<Platform> installed;
+
+// The categories that know their threshold, which is the installed log's.
+std::mutex resolvedLock;
+std::vector<LogCategory*> resolved;
+
+void forgetThresholds()
+{
+    const std::scoped_lock lock(resolvedLock);
+    for (LogCategory* category : resolved)
+        category->forgetThreshold();
+    resolved.clear();
+}
+
+} // namespace
+
+void install(const Platform& platform)
+{
+    installed.emplace(platform);
+    forgetThresholds();
+}
+
+void uninstall()
+{
+    installed.reset();
+    forgetThresholds();
+}
+
+bool isInstalled() noexcept
+{
+    return installed.has_value();
+}
+
+Platform& current()
+{
+    assert(installed && "no platform is installed");
+    return *installed;
+}
+
+bool LogCategory::isEnabledOnceResolved(LogLevel level) noexcept
+{
+    if (!installed)
+        return false;
+    const LogLevel threshold = installed->log.threshold(*this);
+    threshold_.store(static_cast<std::uint8_t>(threshold), std::memory_order_relaxed);
+    const std::scoped_lock lock(resolvedLock);
+    resolved.push_back(this);
+    return level <= threshold;
+}
+
+} // namespace platform

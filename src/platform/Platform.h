@@ -1,0 +1,51 @@
+// The bundle of platform services that the process runs on.
+//
+// The entry point installs it once, before anything else runs; tests install fakes. Free functions
+// reach it as `platform::current()`.
+#pragma once
+
+#include "platform/Analytics.h"
+#include "platform/BugCapture.h"
+#include "platform/Clock.h"
+#include "platform/DeviceProperties.h"
+#include "platform/FeatureFlags.h"
+#include "platform/KernelTrace.h"
+#include "platform/Log.h"
+#include "platform/Notifications.h"
+#include "platform/PerformanceWriter.h"
+#include "platform/Preferences.h"
+#include "platform/ProcessTable.h"
+#include "platform/ReportingChannels.h"
+#include "platform/TraceMarkers.h"
+#include "platform/WorkQueue.h"
+
+namespace platform {
+
+// References to the providers, all of which outlive the installation.
+struct Platform {
+    Log& log;
+    Clock& clock;
+    WorkQueues& workQueues;
+    Preferences& preferences;
+    FeatureFlags& featureFlags;
+    DeviceProperties& deviceProperties;
+    ProcessTable& processTable;
+    Notifications& notifications;
+    Analytics& analytics;
+    TraceMarkers& traceMarkers;
+    ReportingChannels& reportingChannels;
+    BugCapture& bugCapture;
+    KernelTrace& kernelTrace;
+    PerformanceWriter& performanceWriter;
+};
+
+// Makes the platform current. While it is being changed nothing else may use it.
+void install(const Platform& platform);
+// Takes the current platform away again; log statements are then dropped.
+void uninstall();
+
+// The installed platform. Any thread.
+[[nodiscard]] Platform& current();
+[[nodiscard]] bool isInstalled() noexcept;
+
+} // namespace platform

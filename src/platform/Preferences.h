@@ -1,0 +1,20 @@
+// The preferences store: values by domain and key, changed by the device's owner while the service runs.
+#pragma once
+
+#include "foundation/Value.h"
+
+#include <optional>
+#include <string_view>
+
+namespace platform {
+
+// Any thread.
+class Preferences {
+public:
+    virtual ~Preferences() = default;
+    // The value stored now, or nothing.
+    [[nodiscard]] virtual std::optional<foundation::Value> value(std::string_view domain,
+                                                                 std::string_view key) const = 0;
+};
+
+} // namespace platform

@@ -1,0 +1,26 @@
+// The kernel's process table.
+#pragma once
+
+#include <cstdint>
+#include <optional>
+#include <string>
+
+namespace platform {
+
+// One process as the kernel lists it.
+struct ProcessTableEntry {
+    std::int32_t processIdentifier = 0;
+    std::string commandName; // the kernel's short name, at most 15 bytes of UTF-8
+};
+
+// Any thread.
+class ProcessTable {
+public:
+    virtual ~ProcessTable() = default;
+    [[nodiscard]] virtual std::int32_t ownProcessIdentifier() const = 0;
+    [[nodiscard]] virtual std::string ownProcessName() const = 0;
+    // The entry of that process, or nothing when there is none.
+    [[nodiscard]] virtual std::optional<ProcessTableEntry> entry(std::int32_t processIdentifier) const = 0;
+};
+
+} // namespace platform

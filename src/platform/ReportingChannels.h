@@ -1,0 +1,86 @@
+// The kernel's reporting channels: counters, histograms and state residencies that audio drivers publish,
+// found by group and subgroup, sampled together.
+#pragma once
+
+#include <cstdint>
+#include <expected>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace platform {
+
+enum class ChannelFormat : std::uint8_t { Invalid = 0, Simple = 1, State = 2, Histogram = 3 };
+
+struct HistogramBucket {
+    std::int64_t lower = 0;
+    std::int64_t upper = 0;
+    std::int64_t hits = 0;
+    std::int32_t boundsError = 0; // not 0 when the bounds could not be read
+};
+
+struct StateResidency {
+    std::string name;
+    std::uint64_t transitions = 0;
+    std::uint64_t residency = 0;
+    double dutyCycle = 0;
+};
+
+// One channel of a sample. What its format does not have stays empty.
+struct ReportingChannel {
+    std::uint8_t format = 0; // a `ChannelFormat`, or a number that this service does not know
+    std::optional<std::string> driver;
+    std::optional<std::string> group;
+    std::optional<std::string> subgroup;
+    std::optional<std::string> name;
+    std::optional<std::string> unit;
+    std::int64_t value = 0;
+    std::int64_t minimum = 0;
+    std::int64_t maximum = 0;
+    std::vector<HistogramBucket> buckets;
+    std::vector<StateResidency> states;
+};
+
+struct ReportingSample {
+    std::vector<ReportingChannel> channels;
+};
+
+using ReportingChannelError = std::int64_t; // the platform's error code
+
+// Calls that may return a result and an error side by side return both as they came.
+class ReportingChannels {
+public:
+    // What the platform holds behind a set of channels and behind a subscription.
+    class ChannelSet {
+    public:
+        virtual ~ChannelSet() = default;
+    };
+    class Subscription {
+    public:
+        virtual ~Subscription() = default;
+    };
+    struct FoundChannels {
+        std::shared_ptr<ChannelSet> channels; // null: nothing came back
+        std::optional<ReportingChannelError> error;
+    };
+    struct Subscribed {
+        std::shared_ptr<Subscription> subscription;
+        std::shared_ptr<ChannelSet> channels; // null: nothing came back
+        std::optional<ReportingChannelError> error;
+    };
+
+    virtual ~ReportingChannels() = default;
+    // An absent group or subgroup means any.
+    virtual FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
+                                              std::optional<std::string_view> subgroup) = 0;
+    [[nodiscard]] virtual std::size_t channelCount(const ChannelSet& channels) const = 0;
+    virtual Subscribed createSubscription(const ChannelSet& channels) = 0;
+    virtual std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
+                                                                                const ChannelSet& channels) = 0;
+    virtual std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,
+                                                                                   const ReportingSample& to) = 0;
+};
+
+} // namespace platform

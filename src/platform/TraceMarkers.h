@@ -1,0 +1,17 @@
+// Markers in the kernel's trace.
+#pragma once
+
+#include <array>
+#include <cstdint>
+
+namespace platform {
+
+// Any thread.
+class TraceMarkers {
+public:
+    virtual ~TraceMarkers() = default;
+    // One kernel trace event; does nothing where nobody traces.
+    virtual void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) = 0;
+};
+
+} // namespace platform
