@@ -13,7 +13,6 @@
 #include <functional>
 #include <memory>
 #include <string>
-#include <sys/types.h>
 
 namespace platform {
 
@@ -35,6 +34,18 @@ public:
 
     virtual ~Connection() = default;
 
+    // The connection whose call the calling thread is handling, or null.
+    [[nodiscard]] static const Connection* current() noexcept { return current_; }
+
+    // Makes a connection the current one of this thread while its call is being handled.
+    class CallScope {
+    public:
+        explicit CallScope(const Connection& connection) noexcept { current_ = &connection; }
+        ~CallScope() { current_ = nullptr; }
+        CallScope(const CallScope&) = delete;
+        CallScope& operator=(const CallScope&) = delete;
+    };
+
     // Who is at the other end, as the kernel told at acceptance. Any thread.
     [[nodiscard]] virtual std::int32_t processIdentifier() const = 0;
     // The peer in words, for the log. Any thread.
@@ -53,14 +64,20 @@ public:
     // is over is dropped. Frames sent on the server queue leave after the turn, once everything the turn
     // stored is kept. Any thread.
     virtual void send(std::string frame) = 0;
+
+private:
+    static inline thread_local const Connection* current_ = nullptr;
 };
+
+class ConnectionListener;
 
 // Decides on new connections. Called on a connection thread.
 class ConnectionListenerDelegate {
 public:
     virtual ~ConnectionListenerDelegate() = default;
     // True accepts; the delegate has then installed the handlers and resumed the connection.
-    virtual bool shouldAcceptNewConnection(const std::shared_ptr<Connection>& connection) = 0;
+    virtual bool shouldAcceptNewConnection(ConnectionListener& listener,
+                                           const std::shared_ptr<Connection>& connection) = 0;
 };
 
 // The listener of the name under which the process was launched. One a process.

@@ -22,8 +22,8 @@ std::string logPrefix(const LogLocation& location)
     return fmt::format("{:>25}:{:<5} ", location.file, location.line);
 }
 
-void writeLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,
-              fmt::format_args arguments)
+void writeFormattedLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,
+                       fmt::format_args arguments)
 {
     const std::string message = fmt::vformat(format, arguments);
     current().log.write({category, level, location, message});

@@ -8,6 +8,7 @@
 #include <atomic>
 #include <cstdint>
 #include <fmt/core.h>
+#include <string>
 #include <string_view>
 
 namespace platform {
@@ -75,8 +76,16 @@ public:
 [[nodiscard]] std::string logPrefix(const LogLocation& location);
 
 // Formats the message and hands it to the current platform's log.
-void writeLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,
-              fmt::format_args arguments);
+void writeFormattedLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,
+                       fmt::format_args arguments);
+
+// The same, with the arguments checked against the format when it is compiled.
+template <typename... Arguments>
+void writeLog(const LogCategory& category, LogLevel level, LogLocation location,
+              fmt::format_string<Arguments...> format, Arguments&&... arguments)
+{
+    writeFormattedLog(category, level, location, format, fmt::make_format_args(arguments...));
+}
 
 // "/a/b/Name.cpp" is "Name".
 consteval std::string_view baseName(std::string_view path)
@@ -88,13 +97,13 @@ consteval std::string_view baseName(std::string_view path)
 
 } // namespace platform
 
-// KESTO_LOG(category accessor's result, level, format of {fmt}, arguments...)
-#define KESTO_LOG(logCategory, logLevel, format, ...)                                                        \
+// KESTO_LOG(category, level, "format of {fmt}", arguments...)
+#define KESTO_LOG(logCategory, logLevel, ...)                                                                \
     do {                                                                                                     \
         ::platform::LogCategory& kestoLogCategory = (logCategory);                                           \
         if (kestoLogCategory.isEnabled(::platform::LogLevel::logLevel)) [[unlikely]] {                       \
             constexpr std::string_view kestoLogFile = ::platform::baseName(__FILE__);                        \
             ::platform::writeLog(kestoLogCategory, ::platform::LogLevel::logLevel, {kestoLogFile, __LINE__}, \
-                                 FMT_STRING(format), ::fmt::make_format_args(__VA_ARGS__));                  \
+                                 __VA_ARGS__);                                                               \
         }                                                                                                    \
     } while (false)

@@ -1,5 +1,6 @@
 #include "platform/Platform.h"
 
+#include <atomic>
 #include <cassert>
 #include <mutex>
 #include <optional>
@@ -9,6 +10,7 @@ namespace platform {
 namespace {
 
 std::optional<Platform> installed;
+std::atomic<std::uint64_t> installations;
 
 // The categories that know their threshold, which is the installed log's.
 std::mutex resolvedLock;
@@ -27,6 +29,7 @@ void forgetThresholds()
 void install(const Platform& platform)
 {
     installed.emplace(platform);
+    ++installations;
     forgetThresholds();
 }
 
@@ -39,6 +42,11 @@ void uninstall()
 bool isInstalled() noexcept
 {
     return installed.has_value();
+}
+
+std::uint64_t installationNumber() noexcept
+{
+    return installations;
 }
 
 Platform& current()

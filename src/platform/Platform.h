@@ -48,4 +48,8 @@ void uninstall();
 [[nodiscard]] Platform& current();
 [[nodiscard]] bool isInstalled() noexcept;
 
+// Counts the installations, from 1; what is remembered "once for the life of the process" is remembered for
+// one installation, so that tests can live several lives.
+[[nodiscard]] std::uint64_t installationNumber() noexcept;
+
 } // namespace platform

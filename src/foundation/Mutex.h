@@ -1,0 +1,40 @@
+// A mutex that clang can reason about: it proves that what a lock guards is touched only under it.
+#pragma once
+
+#include <mutex>
+
+#if defined(__clang__)
+#define KESTO_THREAD_ANNOTATION(annotation) __attribute__((annotation))
+#else
+#define KESTO_THREAD_ANNOTATION(annotation)
+#endif
+
+// A field that is only read and written while the mutex is held.
+#define KESTO_GUARDED_BY(mutex) KESTO_THREAD_ANNOTATION(guarded_by(mutex))
+// A function that is only called while the mutex is held.
+#define KESTO_REQUIRES(mutex) KESTO_THREAD_ANNOTATION(requires_capability(mutex))
+
+namespace foundation {
+
+class KESTO_THREAD_ANNOTATION(capability("mutex")) Mutex {
+public:
+    void lock() KESTO_THREAD_ANNOTATION(acquire_capability()) { mutex_.lock(); }
+    void unlock() KESTO_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
+
+private:
+    std::mutex mutex_;
+};
+
+// Holds a mutex as long as it lives.
+class KESTO_THREAD_ANNOTATION(scoped_lockable) Lock {
+public:
+    explicit Lock(Mutex& mutex) KESTO_THREAD_ANNOTATION(acquire_capability(mutex)) : mutex_(mutex) { mutex_.lock(); }
+    ~Lock() KESTO_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
+    Lock(const Lock&) = delete;
+    Lock& operator=(const Lock&) = delete;
+
+private:
+    Mutex& mutex_;
+};
+
+} // namespace foundation
