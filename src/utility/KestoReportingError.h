@@ -1,0 +1,22 @@
+// The one error that a client can be answered with, and the callbacks that carry answers.
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <optional>
+#include <string_view>
+
+// A domain and a code, and nothing more.
+struct KestoReportingError {
+    std::string_view domain; // a constant of the program
+    std::int64_t code = 0;
+    friend bool operator==(const KestoReportingError&, const KestoReportingError&) = default;
+};
+
+// Reporting is disabled on this device.
+constexpr KestoReportingError KestoReportingErrorDisabled{"com.quarn.audio.reporting", 1};
+
+// Callbacks that get the error, if any, and the operation's result. May be copied, and called more than once.
+using KestoReportingReply = std::function<void(const std::optional<KestoReportingError>& error)>;
+template <typename Result>
+using KestoReportingResultReply = std::function<void(const std::optional<KestoReportingError>& error, Result result)>;

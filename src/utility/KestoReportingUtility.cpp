@@ -1,0 +1,131 @@
+// Small functions on the platform's clock, process table and device properties, and on payloads.
+#include "utility/KestoReportingUtility.h"
+
+#include "foundation/NumberFormatter.h"
+#include "platform/Platform.h"
+
+#include <algorithm>
+#include <atomic>
+#include <chrono>
+#include <cmath>
+
+bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeout, const bool& flag,
+                               std::string_view waitMessage, std::string_view timeoutMessage,
+                               platform::LogCategory& logCategory)
+{
+    const foundation::Lock lock(condition.lock);
+    while (!flag) {
+        KESTO_LOG(logCategory, Info, "{}", waitMessage);
+        const auto waited = condition.signal.wait_for(condition.lock, std::chrono::duration<double>(timeout));
+        if (waited == std::cv_status::timeout) {
+            KESTO_LOG(logCategory, Error, "{}", timeoutMessage);
+            return false;
+        }
+        KESTO_LOG(logCategory, Info, "continuing");
+    }
+    return true;
+}
+
+void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
+{
+    const foundation::Lock lock(condition.lock);
+    flag = true;
+    condition.signal.notify_one();
+}
+
+bool KestoReportingUtilityIsInternalBuild()
+{
+    // The number of the platform's installation that was asked, and above it the answer's bit.
+    static std::atomic<std::uint64_t> remembered;
+    const std::uint64_t installation = platform::installationNumber();
+    std::uint64_t answer = remembered.load(std::memory_order_relaxed);
+    if (answer >> 1 != installation) {
+        answer = installation << 1
+            | (platform::current().deviceProperties.boolean("InternalBuild").value_or(false) ? 1U : 0U);
+        remembered.store(answer, std::memory_order_relaxed);
+    }
+    return (answer & 1) != 0;
+}
+
+std::optional<std::string> KestoReportingUtilityProcessNameForPID(std::int32_t pid)
+{
+    const platform::ProcessTable& processes = platform::current().processTable;
+    if (pid == processes.ownProcessIdentifier())
+        return processes.ownProcessName();
+    platform::ProcessTableEntry entry;
+    if (pid < 1 || !KestoReportingUtilityProcessInfoForPID(pid, entry))
+        return std::nullopt;
+    return entry.commandName;
+}
+
+bool KestoReportingUtilityProcessInfoForPID(std::int32_t pid, platform::ProcessTableEntry& entry)
+{
+    auto found = platform::current().processTable.entry(pid);
+    if (!found)
+        return false;
+    entry = *std::move(found);
+    return true;
+}
+
+foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Dictionary& dictionary)
+{
+    static const foundation::Value unknown("Unknown");
+    const foundation::Value* name = dictionary.find(KestoReportingHostApplicationKey);
+    return name == nullptr ? unknown : *name;
+}
+
+foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation::Dictionary& message,
+                                                               AudioEventCategory category, AudioEventType type)
+{
+    static const foundation::String tagKey("audiotag");
+    std::string tag = KestoReportingUtilityCategoryString(category);
+    tag += KestoReportingUtilityTypeString(type);
+    return message.with(tagKey, tag);
+}
+
+foundation::Dictionary KestoReportingUtilityRemoveEventEpochTime(const foundation::Dictionary& message)
+{
+    return KestoReportingUtilityIsInternalBuild() ? message : message.without(KestoReportingTimestampKey);
+}
+
+foundation::Dictionary KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message)
+{
+    const auto hasBlank = [](const foundation::DictionaryEntry& entry) { return entry.key.view().contains(' '); };
+    if (std::ranges::none_of(message, hasBlank))
+        return message;
+    foundation::Dictionary::Entries entries(message.begin(), message.end());
+    for (auto& entry : entries) {
+        std::string key(entry.key.view());
+        std::ranges::replace(key, ' ', '_');
+        entry.key = foundation::String(key);
+    }
+    return entries;
+}
+
+double KestoReportingUtilityRoundWithPlaces(double value, int places)
+{
+    const double scale = std::pow(10.0, places);
+    return std::round(value * scale) / scale;
+}
+
+std::optional<std::string> KestoReportingUtilityBucketNumberToString(double number, std::span<const double> buckets,
+                                                                     unsigned places)
+{
+    std::optional<double> chosen;
+    double previousDistance = -1;
+    for (const double bucket : buckets) {
+        const double distance = std::abs(number - bucket);
+        if (previousDistance >= 0 && distance > previousDistance)
+            break;
+        chosen = bucket;
+        previousDistance = distance;
+    }
+    if (!chosen)
+        return std::nullopt;
+    return foundation::formatDecimal(*chosen, places == 0 ? 0 : 1, places);
+}
+
+std::int64_t KestoReportingUtilityExtractSessionIDFromReporterID(std::int64_t reporterID)
+{
+    return reporterID;
+}

@@ -1,0 +1,79 @@
+// Functions that the service, its clients, its sessions and its sinks share: waiting, process names,
+// payload normalisation, bucketing. None keeps state but for the build kind, which is asked for once.
+//
+// All of them may be called from any thread.
+#pragma once
+
+#include "foundation/Mutex.h"
+#include "foundation/Value.h"
+#include "platform/ProcessTable.h"
+#include "utility/KestoReportingLogCategories.h"
+#include "utility/KestoReportingVocabulary.h"
+
+#include <array>
+#include <condition_variable>
+#include <cstdint>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+
+// The payload key of the time that a client gives a message, in seconds since 1970.
+constexpr std::string_view KestoReportingTimestampKey = "kestoreporting_timestamp";
+// The configuration and payload key of the application on whose behalf a client plays.
+constexpr std::string_view KestoReportingHostApplicationKey = "HostApplicationDisplayID";
+
+// A condition variable with its own lock.
+struct KestoReportingCondition {
+    foundation::Mutex lock;
+    std::condition_variable_any signal;
+};
+
+// Waits until the other side has set the flag. Each wait without a signal lasts `timeout` seconds at most; a
+// wake-up without the flag begins a new one. False when one of them timed out.
+bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeout, const bool& flag,
+                               std::string_view waitMessage, std::string_view timeoutMessage,
+                               platform::LogCategory& logCategory);
+// Sets the flag and wakes one waiter.
+void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag);
+
+// Whether the device runs an internal build. Asked once for the life of the process.
+[[nodiscard]] bool KestoReportingUtilityIsInternalBuild();
+
+// The short name of that process; nothing for numbers below 1 and for processes that do not exist.
+[[nodiscard]] std::optional<std::string> KestoReportingUtilityProcessNameForPID(std::int32_t pid);
+// Fills `entry` and returns true when there is such a process.
+[[nodiscard]] bool KestoReportingUtilityProcessInfoForPID(std::int32_t pid, platform::ProcessTableEntry& entry);
+
+// What the dictionary holds as the host application, or "Unknown".
+[[nodiscard]] foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Dictionary& dictionary);
+
+// The payload with "audiotag" set to the names of its category and type, such as "PlaybackStart".
+[[nodiscard]] foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation::Dictionary& message,
+                                                                             AudioEventCategory category,
+                                                                             AudioEventType type);
+// The payload without its time stamp, but as it is on internal builds: only those may keep it.
+[[nodiscard]] foundation::Dictionary KestoReportingUtilityRemoveEventEpochTime(const foundation::Dictionary& message);
+// The payload with "_" for every blank in its keys; of keys that become equal the last one's value stays.
+[[nodiscard]] foundation::Dictionary
+KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message);
+
+// Rounded to that many decimal places, halves away from zero; negative places round to tens, hundreds...
+[[nodiscard]] double KestoReportingUtilityRoundWithPlaces(double value, int places);
+
+// Seconds of playing.
+constexpr std::array<double, 11> KestoReportingUtilityBucketNumberToStringTimes{0,   1,    5,    10,   30,   60,
+                                                                                300, 1800, 3600, 7200, 18000};
+// Volumes in steps of a sixteenth.
+constexpr std::array<double, 17> KestoReportingUtilityBucketNumberToStringVolumes{
+    0.0,    0.0625, 0.125,  0.1875, 0.25,   0.3125, 0.375,  0.4375, 0.5,
+    0.5625, 0.625,  0.6875, 0.75,   0.8125, 0.875,  0.9375, 1.0};
+
+// The text of the bucket nearest to the number, the later one of two that are equally near: the walk stops at
+// the first bucket that is farther away than the one before. Nothing when there are no buckets. With `places`
+// fraction digits at most, and one at least unless `places` is 0.
+[[nodiscard]] std::optional<std::string>
+KestoReportingUtilityBucketNumberToString(double number, std::span<const double> buckets, unsigned places);
+
+// The session ID of a reporter ID, which is the same number.
+[[nodiscard]] std::int64_t KestoReportingUtilityExtractSessionIDFromReporterID(std::int64_t reporterID);
