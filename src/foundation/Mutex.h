@@ -1,6 +1,9 @@
-// A mutex that clang can reason about: it proves that what a lock guards is touched only under it.
+// A mutex that clang can reason about: it proves that what a lock guards is touched only under it. And a
+// condition to wait for while holding it.
 #pragma once
 
+#include <chrono>
+#include <condition_variable>
 #include <mutex>
 
 #if defined(__clang__)
@@ -22,6 +25,7 @@ public:
     void unlock() KESTO_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
 
 private:
+    friend class Condition;
     std::mutex mutex_;
 };
 
@@ -35,6 +39,28 @@ public:
 
 private:
     Mutex& mutex_;
+};
+
+// Sleeps until somebody tells that what a mutex guards has changed. It may wake for nothing: wait in a loop.
+class Condition {
+public:
+    void wait(Mutex& mutex) KESTO_REQUIRES(mutex)
+    {
+        std::unique_lock lock(mutex.mutex_, std::adopt_lock);
+        condition_.wait(lock);
+        lock.release(); // the caller goes on holding it
+    }
+    void waitUntil(Mutex& mutex, std::chrono::steady_clock::time_point deadline) KESTO_REQUIRES(mutex)
+    {
+        std::unique_lock lock(mutex.mutex_, std::adopt_lock);
+        condition_.wait_until(lock, deadline);
+        lock.release();
+    }
+    void notifyOne() noexcept { condition_.notify_one(); }
+    void notifyAll() noexcept { condition_.notify_all(); }
+
+private:
+    std::condition_variable condition_;
 };
 
 } // namespace foundation
