@@ -136,6 +136,13 @@ void appendCbor(const Dictionary& dictionary, std::string& out)
     }
 }
 
+std::size_t cborSize(const Dictionary& dictionary)
+{
+    std::string encoded;
+    appendCbor(dictionary, encoded);
+    return encoded.size();
+}
+
 void appendCbor(const Value& value, std::string& out)
 {
     switch (value.kind()) {
@@ -168,9 +175,9 @@ class CborReader {
 public:
     CborReader(std::string_view bytes, CborDecoder& decoder) : rest_(bytes), decoder_(decoder) { }
 
-    std::expected<Value, CborError> readAll()
+    std::expected<Value, CborError> readAll(unsigned maximumDepth)
     {
-        Value value = readItem(cborMaximumDepth);
+        Value value = readItem(maximumDepth);
         if (error_)
             return std::unexpected(*error_);
         if (!rest_.empty())
@@ -380,9 +387,9 @@ private:
     std::string chunks_;
 };
 
-std::expected<Value, CborError> CborDecoder::decode(std::string_view bytes)
+std::expected<Value, CborError> CborDecoder::decode(std::string_view bytes, unsigned maximumDepth)
 {
-    return CborReader(bytes, *this).readAll();
+    return CborReader(bytes, *this).readAll(maximumDepth);
 }
 
 String CborDecoder::internKey(std::string_view key)

@@ -22,7 +22,7 @@ namespace foundation {
 enum class CborError : std::uint8_t {
     Truncated, // the bytes end inside an item
     TrailingBytes, // bytes follow the item
-    TooDeep, // more than `cborMaximumDepth` containers inside each other
+    TooDeep, // more containers inside each other than allowed
     Malformed, // not well-formed CBOR
     InvalidUtf8, // text that is not UTF-8
     KeyNotText, // a map key of another type
@@ -33,11 +33,15 @@ enum class CborError : std::uint8_t {
 // The error as words for a log line, such as "text is not valid UTF-8".
 [[nodiscard]] std::string_view description(CborError error) noexcept;
 
+// How deep foreign bytes may nest.
 constexpr unsigned cborMaximumDepth = 32;
 
 // Appends the value's encoding: shortest heads, definite lengths, floats in the width of their kind.
 void appendCbor(const Value& value, std::string& out);
 void appendCbor(const Dictionary& dictionary, std::string& out);
+
+// How many bytes that encoding takes.
+[[nodiscard]] std::size_t cborSize(const Dictionary& dictionary);
 
 // The heads by which whoever knows a message's shape encodes it without building values first.
 void appendCborInteger(std::uint64_t value, std::string& out);
@@ -53,8 +57,9 @@ inline void appendCborNull(std::string& out)
 // short keys, so that the keys which every message repeats are made once.
 class CborDecoder {
 public:
-    // The one item that the bytes hold, all of them.
-    [[nodiscard]] std::expected<Value, CborError> decode(std::string_view bytes);
+    // The one item that the bytes hold, all of them, with at most so many containers inside each other.
+    [[nodiscard]] std::expected<Value, CborError> decode(std::string_view bytes,
+                                                         unsigned maximumDepth = cborMaximumDepth);
 
 private:
     friend class CborReader;

@@ -1,0 +1,275 @@
+// The client's life and its operations on sessions. Delivering messages is in a file of its own.
+#include "client/KestoReportingClientServerInstance.h"
+
+#include "client/KestoReportingServerQueue.h"
+#include "platform/Platform.h"
+#include "utility/KestoReportingTraceCodes.h"
+#include "utility/KestoReportingUtility.h"
+
+#include <algorithm>
+#include <cstdlib>
+
+namespace {
+constexpr AudioServiceType serviceTypeTest = 11;
+
+bool isRegistered(const KestoReportingServiceDelegateProtocol& delegate,
+                  const KestoReportingClientServerInstance& client)
+{
+    return std::ranges::any_of(delegate.getAllClients(), [&](const auto& other) { return other.get() == &client; });
+}
+} // namespace
+
+KestoReportingClientServerInstance::KestoReportingClientServerInstance(
+    std::int32_t processIdentifier, std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate)
+    : processIdentifier_(processIdentifier),
+      delegate_(std::move(delegate)),
+      budget_(std::make_shared<KestoReportingStorageBudget>(KestoReportingStorageBudget::clientLimit,
+                                                            KestoReportingStorageBudget::service()))
+{
+    KESTO_LOG(KestoReportingClientCategory(), Default, "new client with pid {}", processIdentifier_);
+}
+
+KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
+{
+    if (sessionsRefused_ != 0)
+        KESTO_LOG(KestoReportingClientCategory(), Error, "client {} was refused {} sessions: it may have {}",
+                  processIdentifier_, sessionsRefused_, mostSessions);
+    KESTO_LOG(KestoReportingClientCategory(), Default, "dealloc {} from the server client list", processIdentifier_);
+}
+
+std::optional<double> KestoReportingClientServerInstance::clientStartDate() const
+{
+    const foundation::Lock lock(registrationLock_);
+    return clientStartDate_;
+}
+
+void KestoReportingClientServerInstance::setClientStartDate(std::optional<double> date)
+{
+    const foundation::Lock lock(registrationLock_);
+    clientStartDate_ = date;
+}
+
+std::optional<std::string> KestoReportingClientServerInstance::clientProcessName() const
+{
+    const foundation::Lock lock(registrationLock_);
+    return clientProcessName_;
+}
+
+void KestoReportingClientServerInstance::setClientProcessName(std::optional<std::string> name)
+{
+    const foundation::Lock lock(registrationLock_);
+    clientProcessName_ = std::move(name);
+}
+
+std::shared_ptr<KestoReportingSession>
+KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t reporterID, bool acrossAllClients) const
+{
+    if (auto session = clientReportingSessionMap_.find(reporterID))
+        return session;
+    const auto delegate = acrossAllClients ? delegate_.lock() : nullptr;
+    return delegate ? delegate->findReportingSessionForID(reporterID) : nullptr;
+}
+
+void KestoReportingClientServerInstance::addSession(std::int64_t reporterID, Session session)
+{
+    clientReportingSessionMap_.set(reporterID, std::move(session));
+    if (const auto delegate = delegate_.lock())
+        delegate->reporterIDAdded(reporterID, *this);
+}
+
+void KestoReportingClientServerInstance::removeSession(std::int64_t reporterID)
+{
+    clientReportingSessionMap_.remove(reporterID);
+    if (const auto delegate = delegate_.lock())
+        delegate->reporterIDRemoved(reporterID, *this);
+}
+
+void KestoReportingClientServerInstance::createReportingSession(std::int64_t reporterID, SuccessReply reply)
+{
+    submit([reporterID, reply = std::move(reply)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "creating session for reporter {}", reporterID);
+        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientCreate);
+        const bool replaces = self.clientReportingSessionMap_.find(reporterID) != nullptr;
+        if (replaces || self.clientReportingSessionMap_.size() < mostSessions) {
+            self.addSession(reporterID,
+                            std::make_shared<KestoReportingSession>(reporterID, std::vector{self.processIdentifier_},
+                                                                    self.budget_));
+            KESTO_LOG(KestoReportingClientCategory(), Default, "session created for reporter {}", reporterID);
+        } else {
+            ++self.sessionsRefused_;
+        }
+        reply(std::nullopt, true);
+    });
+}
+
+void KestoReportingClientServerInstance::setServiceType(AudioServiceType serviceType, std::int64_t reporterID,
+                                                        SuccessReply reply)
+{
+    submit([serviceType, reporterID, reply = std::move(reply)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "setting service type {} for reporter {}", serviceType,
+                  reporterID);
+        if (const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false)) {
+            session->setServiceType(serviceType);
+            KESTO_LOG(KestoReportingClientCategory(), Default, "service type {} set for reporter  {}", serviceType,
+                      reporterID);
+        }
+        reply(std::nullopt, true);
+    });
+}
+
+void KestoReportingClientServerInstance::getServiceNameForReporterID(std::int64_t reporterID, ServiceTypeReply reply)
+{
+    submit([reporterID, reply = std::move(reply)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "fetching seviceType");
+        if (reporterID == 0)
+            reply(std::nullopt, AudioServiceTypeUnknown);
+        const auto session = self.findReportingSessionForID(reporterID, true);
+        const AudioServiceType serviceType = session ? session->serviceType() : AudioServiceTypeUnknown;
+        reply(std::nullopt, serviceType);
+        KESTO_LOG(KestoReportingClientCategory(), Default, "returning service type {} for reporter  {}", serviceType,
+                  reporterID);
+    });
+}
+
+void KestoReportingClientServerInstance::setConfiguration(foundation::Dictionary configuration, std::int64_t reporterID,
+                                                          SuccessReply reply)
+{
+    submit([configuration = std::move(configuration), reporterID, reply = std::move(reply)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "setting configuration");
+        if (const auto session = self.findReportingSessionForID(reporterID, false))
+            session->updateConfigurationWithContentsOfConfiguration(configuration);
+        reply(std::nullopt, true);
+    });
+}
+
+void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t reporterID, SuccessReply reply)
+{
+    submit([reporterID, reply = std::move(reply)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "starting session for reporter {}", reporterID);
+        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientStart);
+        const auto delegate = self.delegate_.lock();
+        const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false);
+        if (!session || session->started() || !delegate)
+            return reply(std::nullopt, true);
+        self.start(*delegate, session, reply);
+    });
+}
+
+void KestoReportingClientServerInstance::start(KestoReportingServiceDelegateProtocol& delegate, const Session& session,
+                                               const SuccessReply& reply)
+{
+    session->start();
+    if (const auto& earlier = session->transactionCompleteBlock())
+        earlier(std::nullopt, true);
+    session->setTransactionCompleteBlock(reply);
+    if (const auto features = delegate.getFeaturesState())
+        session->sendMessage(*features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
+    if (platform::current().featureFlags.isEnabled("Sonalis", "Tracing") && session->serviceType() == serviceTypeTest)
+        reply(std::nullopt, true);
+    logActiveSessions(delegate);
+}
+
+void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply)
+{
+    submit([reporterID, reply = std::move(reply)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "stopping session for reporter {}", reporterID);
+        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientStop);
+        if (reporterID == 0)
+            return reply(std::nullopt, true);
+        const auto session = self.findReportingSessionForID(reporterID, false);
+        if (session && session->started()) {
+            session->stop();
+            if (const auto complete = session->transactionCompleteBlock())
+                complete(std::nullopt, true);
+            session->setTransactionCompleteBlock(nullptr);
+            if (const auto delegate = self.delegate_.lock())
+                logActiveSessions(*delegate);
+        }
+        KESTO_LOG(KestoReportingClientCategory(), Default, "stopping {}", reporterID);
+        reply(std::nullopt, true);
+    });
+}
+
+void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID, SuccessReply reply)
+{
+    submit([reporterID, reply = std::move(reply)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "destroying session for reporter {}", reporterID);
+        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientDestroy);
+        if (reporterID == 0)
+            return reply(std::nullopt, true);
+        if (const auto session = self.clientReportingSessionMap_.find(reporterID)) {
+            if (session->started())
+                session->stop();
+            self.removeSession(reporterID);
+        }
+        KESTO_LOG(KestoReportingClientCategory(), Default, "destroying {}", reporterID);
+        reply(std::nullopt, true);
+    });
+}
+
+void KestoReportingClientServerInstance::reporterID(std::int64_t reporterID, DictionaryReply valid)
+{
+    submit([reporterID, reply = std::move(valid)](auto& self) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "validating reporter {}", reporterID);
+        const auto session = self.findReportingSessionForID(reporterID, true);
+        const foundation::Dictionary result{
+            {"reporterID", session ? reporterID : 0},
+            {"serviceType", session ? session->serviceType() : AudioServiceTypeUnknown}};
+        KESTO_LOG(KestoReportingClientCategory(), Default, "validating reporter {}", reporterID);
+        reply(std::nullopt, result);
+    });
+}
+
+void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
+{
+    submit([reply = std::move(reply)](auto& self) {
+        std::vector<foundation::Value> reporterIDs;
+        if (const auto delegate = self.delegate_.lock())
+            for (const auto& client : delegate->getAllClients())
+                for (const auto& entry : client->clientReportingSessionMap())
+                    reporterIDs.emplace_back(entry.reporterID);
+        reply(std::nullopt, std::move(reporterIDs));
+    });
+}
+
+void KestoReportingClientServerInstance::killService(SuccessReply)
+{
+    KESTO_LOG(KestoReportingClientCategory(), Default, "DESTROYING SERVICE");
+    constexpr int exitStatus = 2;
+    std::_Exit(exitStatus); // at once: other threads are at work, and what was acknowledged is kept already
+}
+
+void KestoReportingClientServerInstance::handleConnectionError()
+{
+    submit([](auto& self) {
+        const auto delegate = self.delegate_.lock();
+        if (!delegate || !isRegistered(*delegate, self))
+            return;
+        std::vector<std::int64_t> reporterIDs;
+        for (const auto& [reporterID, session] : self.clientReportingSessionMap_) {
+            reporterIDs.push_back(reporterID);
+            if (session->started())
+                session->stop();
+        }
+        std::ranges::for_each(reporterIDs, [&](std::int64_t reporterID) { self.removeSession(reporterID); });
+        delegate->removeClient(self.shared_from_this());
+        KESTO_LOG(KestoReportingClientCategory(), Default, "removing {} from the server client list",
+                  self.processIdentifier_);
+    });
+}
+
+void KestoReportingClientServerInstance::logActiveSessions(KestoReportingServiceDelegateProtocol& delegate)
+{
+    const auto active = delegate.getAllActiveReportingSessions();
+    KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
+              delegate.activeSessionCount(), KestoReportingDescriptionOfSessions(active));
+}
+
+std::string KestoReportingDescriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions)
+{
+    std::vector<foundation::Value> descriptions;
+    descriptions.reserve(sessions.size());
+    for (const auto& session : sessions)
+        descriptions.emplace_back(session->description());
+    return foundation::Value(foundation::Array(std::move(descriptions))).text();
+}

@@ -1,0 +1,106 @@
+// One connected client: it owns the client's sessions and carries out its calls on them, on the event sinks and
+// on the service object.
+//
+// A call captures its arguments on the connection's thread and does everything else on the server queue.
+#pragma once
+
+#include "client/KestoReportingServerQueue.h"
+#include "client/KestoReportingServiceDelegateProtocol.h"
+#include "client/KestoReportingServiceProtocol.h"
+#include "client/KestoReportingSessionMap.h"
+#include "foundation/Mutex.h"
+#include "session/KestoReportingStorageBudget.h"
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+
+// Always owned by a shared pointer. Operations of the protocol on a connection thread, the rest on the server
+// queue but for what says otherwise.
+class KestoReportingClientServerInstance final
+    : public KestoReportingServiceProtocol,
+      public std::enable_shared_from_this<KestoReportingClientServerInstance> {
+public:
+    // More sessions than that are not created; the client is answered as always.
+    static constexpr std::size_t mostSessions = 10'000;
+
+    KestoReportingClientServerInstance(std::int32_t processIdentifier,
+                                       std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate);
+    ~KestoReportingClientServerInstance() override;
+    KestoReportingClientServerInstance(const KestoReportingClientServerInstance&) = delete;
+    KestoReportingClientServerInstance& operator=(const KestoReportingClientServerInstance&) = delete;
+
+    // Any thread.
+    [[nodiscard]] std::int32_t processIdentifier() const { return processIdentifier_; }
+    // When the client was registered (seconds since 1970), and its name then. Any thread.
+    [[nodiscard]] std::optional<double> clientStartDate() const;
+    void setClientStartDate(std::optional<double> date);
+    [[nodiscard]] std::optional<std::string> clientProcessName() const;
+    void setClientProcessName(std::optional<std::string> name);
+
+    [[nodiscard]] const KestoReportingSessionMap& clientReportingSessionMap() const
+    {
+        return clientReportingSessionMap_;
+    }
+    // This client's session of that ID or, when asked to look further, that of any client.
+    [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID,
+                                                                                   bool acrossAllClients) const;
+
+    void createReportingSession(std::int64_t reporterID, SuccessReply reply) override;
+    void setServiceType(AudioServiceType serviceType, std::int64_t reporterID, SuccessReply reply) override;
+    void getServiceNameForReporterID(std::int64_t reporterID, ServiceTypeReply reply) override;
+    void setConfiguration(foundation::Dictionary configuration, std::int64_t reporterID, SuccessReply reply) override;
+    void startReportingSessionForID(std::int64_t reporterID, SuccessReply reply) override;
+    void sendMessage(foundation::Dictionary message, AudioEventCategory category, std::uint16_t type,
+                     std::optional<ReporterIDs> reporterIDs, KestoReportingReply reply) override;
+    void stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply) override;
+    void destroyReportingSession(std::int64_t reporterID, SuccessReply reply) override;
+    void reporterID(std::int64_t reporterID, DictionaryReply valid) override;
+    void getAllReporters(ArrayReply reply) override;
+    [[noreturn]] void killService(SuccessReply reply) override;
+
+    // The connection broke or is over: stops and drops all sessions and leaves the registry. A second call finds
+    // nothing left to do. Any thread.
+    void handleConnectionError();
+
+private:
+    // What a message is delivered with.
+    struct Message {
+        foundation::Dictionary payload;
+        AudioEventCategory category;
+        AudioEventType type;
+    };
+    using Session = std::shared_ptr<KestoReportingSession>;
+    using Delegate = std::shared_ptr<KestoReportingServiceDelegateProtocol>;
+
+    // Runs `work(*this)` on the server queue, with this object kept alive.
+    template <typename Work> void submit(Work work)
+    {
+        KestoReportingServerQueue()->submit([self = shared_from_this(), work = std::move(work)] { work(*self); });
+    }
+    void start(KestoReportingServiceDelegateProtocol& delegate, const Session& session, const SuccessReply& reply);
+    static void deliverToSinks(const Message& message, const Session& session);
+    static void deliverToSession(const Message& message, const Session& session);
+    void deliverToReporters(const Message& message, const ReporterIDs& reporterIDs) const;
+    static void deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
+    static void deliverStandalone(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
+    static void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
+    void addSession(std::int64_t reporterID, Session session);
+    void removeSession(std::int64_t reporterID);
+
+    const std::int32_t processIdentifier_;
+    std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);
+    std::optional<std::string> clientProcessName_ KESTO_GUARDED_BY(registrationLock_);
+    KestoReportingSessionMap clientReportingSessionMap_;
+    const std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate_;
+
+    std::shared_ptr<KestoReportingStorageBudget> budget_;
+    std::uint64_t sessionsRefused_ = 0;
+    mutable foundation::Mutex registrationLock_;
+};
+
+// The sessions' descriptions as one text for the log.
+[[nodiscard]] std::string
+KestoReportingDescriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions);

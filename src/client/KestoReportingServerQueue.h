@@ -1,0 +1,16 @@
+// The server queue: the one serial queue on which everything runs that touches clients and sessions, so that
+// none of it needs a lock.
+#pragma once
+
+#include "platform/WorkQueue.h"
+
+#include <memory>
+#include <string_view>
+
+constexpr std::string_view gReportingQueueName = "com.quarn.kesto.reporting.server";
+
+// Makes the queue, in place of the one before. Before any client is accepted.
+void KestoReportingCreateServerQueue();
+
+// The queue. Any thread.
+[[nodiscard]] const std::shared_ptr<platform::WorkQueue>& KestoReportingServerQueue();

@@ -1,0 +1,41 @@
+// What a client object may ask of the one service object.
+#pragma once
+
+#include "foundation/Value.h"
+#include "session/KestoReportingSession.h"
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <vector>
+
+class KestoReportingClientServerInstance;
+
+// On the server queue, but for what says otherwise.
+class KestoReportingServiceDelegateProtocol {
+public:
+    using Clients = std::vector<std::shared_ptr<KestoReportingClientServerInstance>>;
+    using Sessions = std::vector<std::shared_ptr<KestoReportingSession>>;
+
+    virtual ~KestoReportingServiceDelegateProtocol() = default;
+
+    // The service-wide defaults, read once at start. Any thread.
+    [[nodiscard]] virtual foundation::Dictionary getDefaults() const = 0;
+    // The device-wide settings as they are now, or nothing when none is known.
+    [[nodiscard]] virtual std::optional<foundation::Dictionary> getFeaturesState() = 0;
+    // The connected clients in the order of registration: the registry itself, not a copy.
+    [[nodiscard]] virtual const Clients& getAllClients() const = 0;
+    [[nodiscard]] virtual bool isReportingEnabled() const = 0;
+    // The started sessions of all clients, in the order of registration and then of creation.
+    [[nodiscard]] virtual Sessions getAllActiveReportingSessions() = 0;
+    // The session of that ID which belongs to the client registered first, or null. Any thread.
+    [[nodiscard]] virtual std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) = 0;
+    virtual void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) = 0;
+    // A counter that is shown and never changed by the service itself. Any thread.
+    [[nodiscard]] virtual std::int64_t activeSessionCount() const = 0;
+    virtual void setActiveSessionCount(std::int64_t count) = 0;
+
+    // Tells that the client's session map gained or lost this ID, which the look-up over all clients relies on.
+    virtual void reporterIDAdded(std::int64_t reporterID, const KestoReportingClientServerInstance& client) = 0;
+    virtual void reporterIDRemoved(std::int64_t reporterID, const KestoReportingClientServerInstance& client) = 0;
+};

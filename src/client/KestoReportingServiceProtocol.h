@@ -1,0 +1,45 @@
+// The interface that the service exports on every client connection.
+//
+// Every operation is one-way and answers through its reply, perhaps later than operations called after it, and
+// in one case twice. Reporter IDs are chosen by the client; 0 stands for no session.
+#pragma once
+
+#include "foundation/Value.h"
+#include "utility/KestoReportingError.h"
+#include "utility/KestoReportingVocabulary.h"
+
+#include <cstdint>
+#include <optional>
+#include <vector>
+
+// Called on a connection thread; replies are called on the server queue.
+class KestoReportingServiceProtocol {
+public:
+    using SuccessReply = KestoReportingResultReply<bool>;
+    using ServiceTypeReply = KestoReportingResultReply<AudioServiceType>;
+    using DictionaryReply = KestoReportingResultReply<const foundation::Dictionary&>;
+    using ArrayReply = KestoReportingResultReply<const foundation::Array&>;
+    using ReporterIDs = std::vector<std::int64_t>;
+
+    virtual ~KestoReportingServiceProtocol() = default;
+
+    // In the order that numbers them on the wire, from 1.
+    virtual void createReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
+    virtual void setServiceType(AudioServiceType serviceType, std::int64_t reporterID, SuccessReply reply) = 0;
+    // Answers ID 0 twice: at once with 65535, and with what the look-up finds.
+    virtual void getServiceNameForReporterID(std::int64_t reporterID, ServiceTypeReply reply) = 0;
+    virtual void setConfiguration(foundation::Dictionary configuration, std::int64_t reporterID,
+                                  SuccessReply reply) = 0;
+    // Answered when the started session's work ends.
+    virtual void startReportingSessionForID(std::int64_t reporterID, SuccessReply reply) = 0;
+    // No list means all started sessions of all clients.
+    virtual void sendMessage(foundation::Dictionary message, AudioEventCategory category, std::uint16_t type,
+                             std::optional<ReporterIDs> reporterIDs, KestoReportingReply reply) = 0;
+    virtual void stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply) = 0;
+    virtual void destroyReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
+    // Answers {"reporterID", "serviceType"}: 0 and 65535 when there is no such session.
+    virtual void reporterID(std::int64_t reporterID, DictionaryReply valid) = 0;
+    virtual void getAllReporters(ArrayReply reply) = 0;
+    // Ends the process with exit status 2; the reply is never called.
+    virtual void killService(SuccessReply reply) = 0;
+};

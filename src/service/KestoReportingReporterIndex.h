@@ -1,0 +1,55 @@
+// Which clients have a session of a reporter ID, so that looking one up over all clients costs the same
+// however many there are.
+//
+// What it must equal is a walk over the registry in the order of registration that stops at the first client
+// which has the ID; so the clients of an ID are kept in that order.
+#pragma once
+
+#include <cstdint>
+#include <map>
+#include <memory>
+#include <unordered_map>
+
+class KestoReportingClientServerInstance;
+
+// The owner keeps calls apart: one thread at a time. Clients that are not registered do not count.
+class KestoReportingReporterIndex {
+public:
+    using Client = KestoReportingClientServerInstance;
+
+    void registerClient(const Client& client) { registrationOf_.try_emplace(&client, nextRegistration_++); }
+
+    // Every ID of the client has been removed before.
+    void unregisterClient(const Client& client) { registrationOf_.erase(&client); }
+
+    void add(std::int64_t reporterID, const Client& client)
+    {
+        if (const auto registration = registrationOf_.find(&client); registration != registrationOf_.end())
+            clientsOf_[reporterID].try_emplace(registration->second, &client);
+    }
+
+    void remove(std::int64_t reporterID, const Client& client)
+    {
+        const auto registration = registrationOf_.find(&client);
+        const auto clients = clientsOf_.find(reporterID);
+        if (registration == registrationOf_.end() || clients == clientsOf_.end())
+            return;
+        clients->second.erase(registration->second);
+        if (clients->second.empty())
+            clientsOf_.erase(clients);
+    }
+
+    // The client registered first of those that have the ID, or null.
+    [[nodiscard]] const Client* find(std::int64_t reporterID) const
+    {
+        const auto clients = clientsOf_.find(reporterID);
+        return clients == clientsOf_.end() ? nullptr : clients->second.begin()->second;
+    }
+
+private:
+    using Registration = std::uint64_t;
+
+    Registration nextRegistration_ = 0;
+    std::unordered_map<const Client*, Registration> registrationOf_;
+    std::unordered_map<std::int64_t, std::map<Registration, const Client*>> clientsOf_;
+};

@@ -1,0 +1,108 @@
+// The service object's making, its defaults, and the registry of clients.
+#include "service/KestoReportingServiceDelegate.h"
+
+#include "client/KestoReportingClientServerInstance.h"
+#include "client/KestoReportingServerQueue.h"
+#include "platform/Platform.h"
+#include "utility/KestoReportingUtility.h"
+
+namespace {
+constexpr std::string_view preferencesDomain = "com.quarn.kesto";
+constexpr std::string_view deviceNameKey = "device_name";
+constexpr std::string_view disableReportingKey = "disable_reporting";
+} // namespace
+
+std::shared_ptr<KestoReportingServiceDelegate> KestoReportingServiceDelegate::make()
+{
+    KestoReportingCreateServerQueue();
+    std::shared_ptr<KestoReportingServiceDelegate> service(new KestoReportingServiceDelegate);
+    service->listenForFeatureStateChanges();
+    return service;
+}
+
+KestoReportingServiceDelegate::KestoReportingServiceDelegate()
+    : features_{{"com.quarn.halden",
+                 "spatial-audio-accessory-feature",
+                 "com.quarn.halden.spatial-audio-accessory-feature.changed",
+                 {}},
+                {std::string(preferencesDomain),
+                 std::string(deviceNameKey),
+                 std::string(gReportingNotifydNotificationName),
+                 {}},
+                {std::nullopt, "ringerstate", "com.quarn.halden.ringerstate", {}}},
+      defaults_(KestoReportingDefaults())
+{
+}
+
+foundation::Dictionary KestoReportingServiceDelegate::KestoReportingDefaults()
+{
+    const platform::Preferences& preferences = platform::current().preferences;
+    foundation::Dictionary::Entries defaults;
+    if (const auto deviceName = preferences.value(preferencesDomain, deviceNameKey))
+        defaults.push_back({deviceNameKey, deviceName->text()});
+    const auto disabled = preferences.value(preferencesDomain, disableReportingKey);
+    defaults.push_back({disableReportingKey, disabled && disabled->asBoolean() ? 1 : 0});
+    return defaults;
+}
+
+void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)
+{
+    clients_.push_back(client);
+    {
+        const foundation::Lock lock(lock_);
+        reporterIndex_.registerClient(*client);
+    }
+    client->setClientStartDate(platform::current().clock.secondsSince1970());
+    client->setClientProcessName(KestoReportingUtilityProcessNameForPID(client->processIdentifier()));
+}
+
+void KestoReportingServiceDelegate::removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)
+{
+    const foundation::Lock lock(lock_);
+    reporterIndex_.unregisterClient(*client);
+    std::erase(clients_, client);
+}
+
+void KestoReportingServiceDelegate::reporterIDAdded(std::int64_t reporterID,
+                                                    const KestoReportingClientServerInstance& client)
+{
+    const foundation::Lock lock(lock_);
+    reporterIndex_.add(reporterID, client);
+}
+
+void KestoReportingServiceDelegate::reporterIDRemoved(std::int64_t reporterID,
+                                                      const KestoReportingClientServerInstance& client)
+{
+    const foundation::Lock lock(lock_);
+    reporterIndex_.remove(reporterID, client);
+}
+
+KestoReportingServiceDelegateProtocol::Sessions KestoReportingServiceDelegate::getAllActiveReportingSessions()
+{
+    Sessions active;
+    for (const auto& client : getAllClients()) {
+        Sessions sessions;
+        for (const auto& entry : client->clientReportingSessionMap())
+            sessions.push_back(entry.session);
+        KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "sessions for client {} : {}",
+                  client->processIdentifier(), KestoReportingDescriptionOfSessions(sessions));
+        std::erase_if(sessions, [](const auto& session) { return !session->started(); });
+        active.insert(active.end(), sessions.begin(), sessions.end());
+    }
+    return active;
+}
+
+std::shared_ptr<KestoReportingSession> KestoReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID)
+{
+    const foundation::Lock lock(lock_);
+    if (reporterID == 0 || !reportingEnabled_)
+        return nullptr;
+    const KestoReportingClientServerInstance* client = reporterIndex_.find(reporterID);
+    if (client == nullptr) {
+        KESTO_LOG(KestoReportingServiceDelegateCategory(), Error, "failed to find reporting session {}", reporterID);
+        return nullptr;
+    }
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "found reporting session {} for client {}", reporterID,
+              client->processIdentifier());
+    return client->clientReportingSessionMap().find(reporterID);
+}

@@ -1,0 +1,79 @@
+// The one service object: it accepts connections, keeps the registry of clients, and knows what is the same for
+// all of them: the defaults, the master switch, the device-wide features.
+//
+// Client objects reach it only through `KestoReportingServiceDelegateProtocol`.
+#pragma once
+
+#include "client/KestoReportingServiceDelegateProtocol.h"
+#include "foundation/Mutex.h"
+#include "platform/Connection.h"
+#include "service/KestoReportingReporterIndex.h"
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+// Announces that the service's own preferences changed.
+constexpr std::string_view gReportingNotifydNotificationName = "com.quarn.kesto.reporting";
+
+// Acceptance and the handlers of a connection's end run on a connection thread; everything else on the server
+// queue, but for what the protocol says otherwise.
+class KestoReportingServiceDelegate final : public KestoReportingServiceDelegateProtocol,
+                                            public platform::ConnectionListenerDelegate,
+                                            public std::enable_shared_from_this<KestoReportingServiceDelegate> {
+public:
+    // Makes the server queue and the service object, which reads its defaults and listens for feature changes. Main
+    // thread, once.
+    static std::shared_ptr<KestoReportingServiceDelegate> make();
+
+    // Reads the defaults from the preferences.
+    [[nodiscard]] static foundation::Dictionary KestoReportingDefaults();
+
+    // Always accepts: makes the client object, submits its registration and follows the connection's end.
+    bool shouldAcceptNewConnection(platform::ConnectionListener& listener,
+                                   const std::shared_ptr<platform::Connection>& connection) override;
+
+    [[nodiscard]] foundation::Dictionary getDefaults() const override { return defaults_; }
+    [[nodiscard]] std::optional<foundation::Dictionary> getFeaturesState() override;
+    [[nodiscard]] const Clients& getAllClients() const override { return clients_; }
+    [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
+    [[nodiscard]] Sessions getAllActiveReportingSessions() override;
+    [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
+    void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) override;
+    [[nodiscard]] std::int64_t activeSessionCount() const override { return activeSessionCount_; }
+    void setActiveSessionCount(std::int64_t count) override { activeSessionCount_ = count; }
+    void reporterIDAdded(std::int64_t reporterID, const KestoReportingClientServerInstance& client) override;
+    void reporterIDRemoved(std::int64_t reporterID, const KestoReportingClientServerInstance& client) override;
+
+private:
+    // A device-wide setting that sessions are told. One with a defaults domain is read from the preferences under
+    // its own name; one without is the state of its notification.
+    struct Feature {
+        std::optional<std::string> defaultsDomain;
+        std::string featureDomain;
+        std::string notification;
+        std::optional<std::int32_t> notifyToken; // of the registration
+    };
+
+    KestoReportingServiceDelegate();
+    void listenForFeatureStateChanges();
+    void handleFeatureChange(std::int32_t token);
+    [[nodiscard]] static std::optional<foundation::Value> valueOf(const Feature& feature);
+    [[nodiscard]] std::string descriptionOfFeatures() const;
+    void registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client);
+    static void handleInvalidation(std::int32_t processIdentifier,
+                                   const std::shared_ptr<KestoReportingClientServerInstance>& client);
+
+    const bool reportingEnabled_ = true;
+    std::atomic<std::int64_t> activeSessionCount_{0};
+    Clients clients_;
+    std::vector<Feature> features_;
+    const foundation::Dictionary defaults_;
+
+    foundation::Mutex lock_;
+    KestoReportingReporterIndex reporterIndex_ KESTO_GUARDED_BY(lock_);
+};

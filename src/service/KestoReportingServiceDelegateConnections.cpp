@@ -1,0 +1,76 @@
+// A connection's beginning and end: the client object is made and registered, and when the peer is gone its
+// sessions are stopped and the time it was connected becomes an event.
+#include "client/KestoReportingClientServerInstance.h"
+#include "client/KestoReportingServerQueue.h"
+#include "client/KestoReportingServiceProtocolAdapter.h"
+#include "platform/Platform.h"
+#include "service/KestoReportingServiceDelegate.h"
+#include "utility/KestoReportingUtility.h"
+
+#include <cmath>
+
+bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::ConnectionListener&,
+                                                              const std::shared_ptr<platform::Connection>& connection)
+{
+    using Client = KestoReportingClientServerInstance;
+    const std::int32_t processIdentifier = connection->processIdentifier();
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "newConnection: {}", connection->description());
+
+    std::weak_ptr<Client> weakClient;
+    {
+        const foundation::Lock lock(lock_);
+        const auto client = std::make_shared<Client>(processIdentifier, weak_from_this());
+        weakClient = client;
+        connection->setCallHandler(
+            [adapter = KestoReportingServiceProtocolAdapter(client, connection)](
+                platform::Connection::Call call) mutable { return adapter.handleCall(std::move(call)); });
+    }
+    KestoReportingServerQueue()->submit([self = shared_from_this(), weakClient] {
+        if (const auto client = weakClient.lock())
+            self->registerClient(client);
+    });
+    connection->setInterruptionHandler([weakClient] {
+        KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "interruptionHandler: connection exited");
+        if (const auto client = weakClient.lock())
+            client->handleConnectionError();
+    });
+    connection->setInvalidationHandler(
+        [weakClient, processIdentifier] { handleInvalidation(processIdentifier, weakClient.lock()); });
+    connection->resume();
+    return true;
+}
+
+void KestoReportingServiceDelegate::handleInvalidation(
+    std::int32_t processIdentifier, const std::shared_ptr<KestoReportingClientServerInstance>& client)
+{
+    std::optional<double> startDate;
+    std::optional<std::string> processName;
+    if (client) {
+        client->handleConnectionError();
+        startDate = client->clientStartDate();
+        processName = client->clientProcessName();
+    }
+    const std::string shownName = processName.value_or("unknown");
+    const double now = platform::current().clock.secondsSince1970();
+    foundation::Number uptime(-1);
+    if (startDate) {
+        uptime = foundation::Number(std::abs(now - *startDate));
+        if (*startDate > now)
+            KESTO_LOG(KestoReportingServiceDelegateCategory(), Default,
+                      "clientStartDate is in the past. clientpid={} clientprocessname={}", processIdentifier,
+                      shownName);
+    } else {
+        KESTO_LOG(KestoReportingServiceDelegateCategory(), Default,
+                  "clientStartDate is nil. clientpid={} clientprocessname={}", processIdentifier, shownName);
+    }
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Default,
+              "invalidationHandler: connection exited process={} uptime_sec={}", shownName, uptime.int64Value());
+    if (!processName) {
+        KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "clientProcessName is nil. clientpid={}",
+                  processIdentifier);
+        return;
+    }
+    platform::current().analytics.sendAnalyticsEventLazy(
+        "com.quarn.kesto.kestoreportingclientuptime",
+        [name = *processName, uptime] { return foundation::Dictionary{{"processName", name}, {"seconds", uptime}}; });
+}

@@ -1,0 +1,77 @@
+// Device-wide settings as messages: the accessory setting of the home screen, the device's name and the ringer
+// switch are sent to a session when it starts, and to all sessions when one of them changes.
+#include "client/KestoReportingClientServerInstance.h"
+#include "client/KestoReportingServerQueue.h"
+#include "platform/Platform.h"
+#include "service/KestoReportingServiceDelegate.h"
+#include "utility/KestoReportingUtility.h"
+
+#include <cmath>
+
+void KestoReportingServiceDelegate::listenForFeatureStateChanges()
+{
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "listening for features {}", descriptionOfFeatures());
+    for (Feature& feature : features_) {
+        const auto [status, token] = platform::current().notifications.registerNotification(
+            feature.notification, KestoReportingServerQueue(), [service = weak_from_this()](std::int32_t changed) {
+                if (const auto self = service.lock())
+                    self->handleFeatureChange(changed);
+            });
+        feature.notifyToken = token;
+        KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "notify setup result {} token {}", status, token);
+    }
+}
+
+std::optional<foundation::Dictionary> KestoReportingServiceDelegate::getFeaturesState()
+{
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "getting features");
+    foundation::Dictionary::Entries state;
+    for (const Feature& feature : features_)
+        if (auto value = valueOf(feature))
+            state.push_back({std::string_view(feature.featureDomain), *std::move(value)});
+    if (state.empty())
+        return std::nullopt;
+    const platform::Clock& clock = platform::current().clock;
+    state.push_back({KestoReportingTimestampKey, clock.secondsSince1970()});
+    state.push_back({"systemuptime_sec", static_cast<std::int32_t>(std::lround(clock.systemUptime()))});
+    return state;
+}
+
+std::optional<foundation::Value> KestoReportingServiceDelegate::valueOf(const Feature& feature)
+{
+    if (feature.defaultsDomain)
+        return platform::current().preferences.value(*feature.defaultsDomain, feature.featureDomain);
+    if (!feature.notifyToken)
+        return std::nullopt;
+    const auto state = platform::current().notifications.state(*feature.notifyToken);
+    if (!state)
+        return std::nullopt;
+    return *state == 1;
+}
+
+void KestoReportingServiceDelegate::handleFeatureChange(std::int32_t token)
+{
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "feature {} changes", token);
+    const auto state = getFeaturesState();
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "defaults {}",
+              state ? foundation::Value(*state).text() : "(null)");
+    for (const auto& client : clients_)
+        for (const auto& entry : client->clientReportingSessionMap())
+            entry.session->sendMessage(state, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
+}
+
+std::string KestoReportingServiceDelegate::descriptionOfFeatures() const
+{
+    std::vector<foundation::Value> table;
+    for (const Feature& feature : features_) {
+        foundation::Dictionary::Entries entry;
+        if (feature.defaultsDomain)
+            entry.push_back({"defaults_domain", *feature.defaultsDomain});
+        entry.push_back({"feature_domain", feature.featureDomain});
+        entry.push_back({"notification", feature.notification});
+        if (feature.notifyToken)
+            entry.push_back({"notify_token", *feature.notifyToken});
+        table.emplace_back(foundation::Dictionary(std::move(entry)));
+    }
+    return foundation::Value(foundation::Array(std::move(table))).text();
+}

@@ -1,0 +1,102 @@
+// The session's life: creation, configuration, start, stop and teardown.
+#include "session/KestoReportingSession.h"
+
+#include "foundation/Cbor.h"
+#include "platform/Platform.h"
+#include "utility/KestoReportingTraceCodes.h"
+#include "utility/KestoReportingUtility.h"
+
+#include <fmt/format.h>
+
+const foundation::String KestoReportingTraceTypeKtrace("ktrace");
+
+KestoReportingSession::KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
+                                             std::shared_ptr<KestoReportingStorageBudget> budget)
+    : reporterID_(reporterID),
+      processIdentifiers_(std::move(processIdentifiers)),
+      budget_(std::move(budget))
+{
+    KESTO_LOG(KestoReportingSessionCategory(), Info, "created reporting session for ID: {}", reporterID_);
+    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionCreated);
+}
+
+KestoReportingSession::~KestoReportingSession()
+{
+    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionDestroyed);
+    KESTO_LOG(KestoReportingSessionCategory(), Info, "deallocing this session {}", reporterID_);
+}
+
+std::string KestoReportingSession::description() const
+{
+    return fmt::format("reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}", reporterID_,
+                       serviceName_.empty() ? "(null)" : serviceName_,
+                       processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
+                       KestoReportingUtilityRetrieveAppName(configuration()).text(), started_ ? 1 : 0);
+}
+
+void KestoReportingSession::setServiceType(AudioServiceType type)
+{
+    serviceType_ = type;
+    serviceName_ = KestoReportingUtilityGenerateServiceNameFromServiceType(type);
+    KESTO_LOG(KestoReportingSessionCategory(), Info, "setting service type {}", serviceName_);
+}
+
+foundation::Dictionary KestoReportingSession::configuration() const
+{
+    const foundation::Lock lock(configurationLock_);
+    return configuration_;
+}
+
+void KestoReportingSession::setConfiguration(const std::optional<foundation::Dictionary>& configuration)
+{
+    updateConfigurationWithContentsOfConfiguration(configuration);
+}
+
+void KestoReportingSession::updateConfigurationWithContentsOfConfiguration(
+    const std::optional<foundation::Dictionary>& configuration)
+{
+    if (!configuration)
+        return;
+    const foundation::Lock lock(configurationLock_);
+    foundation::Dictionary merged = configuration_.mergedWith(*configuration);
+    if (foundation::cborSize(merged) > largestConfiguration) {
+        KESTO_LOG(KestoReportingSessionCategory(), Error,
+                  "configuration of session {} would take more than {} bytes; the change is ignored", reporterID_,
+                  largestConfiguration);
+        return;
+    }
+    configuration_ = std::move(merged);
+}
+
+void KestoReportingSession::start()
+{
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "starting session owned by {}", reporterID_);
+    if (started_) {
+        KESTO_LOG(KestoReportingSessionCategory(), Info, "{} is already started", reporterID_);
+        return;
+    }
+    started_ = true;
+    messagesLost_ = 0;
+    {
+        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+        nestedAggregatedPayloadData_ = std::make_unique<KestoReportingMessageStore>(budget_);
+    }
+    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStarted);
+}
+
+void KestoReportingSession::stop()
+{
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
+    if (!started_)
+        return;
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
+    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStopping);
+    if (messagesLost_ != 0)
+        KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for want of memory", reporterID_,
+                  messagesLost_);
+    {
+        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+        nestedAggregatedPayloadData_.reset();
+    }
+    started_ = false;
+}

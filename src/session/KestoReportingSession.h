@@ -1,0 +1,114 @@
+// One reporting session of one client process: identity, service type, configuration, and, between start and
+// stop, the messages that were sent to it.
+//
+// A session records and says nothing to anybody: handing messages to the sinks is its client instance's work,
+// which calls the session and the sinks side by side.
+#pragma once
+
+#include "foundation/Mutex.h"
+#include "foundation/Value.h"
+#include "session/KestoReportingMessageStore.h"
+#include "sinks/KestoReportingSinkSession.h"
+#include "utility/KestoReportingError.h"
+
+#include <atomic>
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+// The one value of "KestoReportingTraceType" that lets a trace start. Told by its identity: text that a client
+// sends never is this object.
+extern const foundation::String KestoReportingTraceTypeKtrace;
+
+// Driven from the server queue. What sinks read (service type, configuration) may be read from any thread.
+class KestoReportingSession final : public KestoReportingSinkSession {
+public:
+    // The identity never changes. The first process is the session's owner. Recorded messages are paid from
+    // the budget.
+    KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
+                          std::shared_ptr<KestoReportingStorageBudget> budget = KestoReportingStorageBudget::service());
+    ~KestoReportingSession() override;
+    KestoReportingSession(const KestoReportingSession&) = delete;
+    KestoReportingSession& operator=(const KestoReportingSession&) = delete;
+
+    [[nodiscard]] std::int64_t reporterID() const { return reporterID_; }
+    [[nodiscard]] const std::vector<std::int32_t>& processIdentifiers() const { return processIdentifiers_; }
+    // One line for the log.
+    [[nodiscard]] std::string description() const;
+
+    void setServiceType(AudioServiceType type);
+    [[nodiscard]] AudioServiceType serviceType() const override { return serviceType_; }
+    // The service type's name; empty until one was set.
+    [[nodiscard]] std::string_view serviceName() const { return serviceName_; }
+
+    [[nodiscard]] foundation::Dictionary configuration() const override;
+    // Adds all entries, replacing those of the same key; no dictionary changes nothing. A configuration that would
+    // outgrow `largestConfiguration` bytes stays as it was, with a log line.
+    void setConfiguration(const std::optional<foundation::Dictionary>& configuration);
+    void updateConfigurationWithContentsOfConfiguration(const std::optional<foundation::Dictionary>& configuration);
+    static constexpr std::size_t largestConfiguration = std::size_t{1} << 20;
+
+    [[nodiscard]] bool started() const { return started_; }
+    // Begins a run with an empty store; a session that is started already goes on as it is.
+    void start();
+    // Ends the run and drops what it recorded. Nothing happens to a session that is not started.
+    void stop();
+
+    // Normalises and records the message, then calls the reply, if there is one, with no error. `sync` makes no
+    // difference: the message is always handled at once on the caller's thread. No message is an empty one.
+    void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
+                     AudioEventType type, bool sync, const KestoReportingReply& reply);
+    void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
+                     AudioEventType type, const KestoReportingReply& reply);
+    // Records the normalised message, unless it repeats the one before of its kind: true when it was dropped
+    // for that.
+    bool createMessageIdentifier(AudioEventCategory category, AudioEventType type,
+                                 const foundation::Dictionary& message);
+    // Accepts a message outside of any session and does nothing with it, a second later; the reply is not called.
+    static void sendSingleMessage(const foundation::Dictionary& message, AudioEventCategory category,
+                                  AudioEventType type, AudioServiceType serviceType,
+                                  const foundation::Dictionary& userInfo, const KestoReportingReply& reply);
+
+    // The reply of the call that started this run, kept by the client instance until its work is done.
+    [[nodiscard]] const KestoReportingResultReply<bool>& transactionCompleteBlock() const
+    {
+        return transactionCompleteBlock_;
+    }
+    void setTransactionCompleteBlock(KestoReportingResultReply<bool> block)
+    {
+        transactionCompleteBlock_ = std::move(block);
+    }
+
+    // Asked for by the client; kept for it and never read here.
+    [[nodiscard]] bool blinReportingEnabled() const { return blinReportingEnabled_; }
+    void setBlinReportingEnabled(bool enabled) { blinReportingEnabled_ = enabled; }
+
+    // This run's messages, each a dictionary of one entry, identifier to payload; nothing while not started.
+    [[nodiscard]] std::optional<std::vector<foundation::Dictionary>> nestedAggregatedPayloadData() const;
+    // By kind, how many messages this run accepted; nothing while not started.
+    [[nodiscard]] std::optional<foundation::Dictionary> messageIdentifierCounts() const;
+
+    // Constant answers.
+    [[nodiscard]] static std::optional<foundation::Value> getBlinReportingStartedState() { return std::nullopt; }
+    [[nodiscard]] static std::optional<std::string> getPTTraceFileURL() { return std::nullopt; }
+    [[nodiscard]] static bool shouldReportOrientation() { return false; }
+
+private:
+    bool started_ = false;
+    bool blinReportingEnabled_ = false;
+    std::atomic<AudioServiceType> serviceType_{0};
+    foundation::Dictionary configuration_ KESTO_GUARDED_BY(configurationLock_);
+    KestoReportingResultReply<bool> transactionCompleteBlock_;
+    const std::int64_t reporterID_;
+    const std::vector<std::int32_t> processIdentifiers_;
+    std::unique_ptr<KestoReportingMessageStore>
+        nestedAggregatedPayloadData_ KESTO_GUARDED_BY(nestedAggregatedPayloadDataLock_);
+    std::string_view serviceName_;
+
+    std::shared_ptr<KestoReportingStorageBudget> budget_;
+    std::uint64_t messagesLost_ = 0; // in this run, for want of memory
+    mutable foundation::Mutex configurationLock_;
+    mutable foundation::Mutex nestedAggregatedPayloadDataLock_;
+};

@@ -1,0 +1,83 @@
+// Receiving a message: it is normalised, compared with the one before of its kind, and recorded.
+#include "platform/Platform.h"
+#include "session/KestoReportingSession.h"
+#include "utility/KestoReportingTraceCodes.h"
+#include "utility/KestoReportingUtility.h"
+
+#include <chrono>
+#include <random>
+
+void KestoReportingSession::sendMessage(const std::optional<foundation::Dictionary>& message,
+                                        AudioEventCategory category, AudioEventType type, [[maybe_unused]] bool sync,
+                                        const KestoReportingReply& reply)
+{
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending message for session owned by {}", reporterID_);
+    const auto named = KestoReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(foundation::Dictionary()));
+    const auto tagged = KestoReportingUtilityAddAudioMessageTag(named, category, type);
+    const auto normalised = KestoReportingUtilityRemoveEventEpochTime(tagged);
+    createMessageIdentifier(category, type, normalised);
+    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionMessageAccepted);
+    if (reply)
+        reply(std::nullopt);
+}
+
+void KestoReportingSession::sendMessage(const std::optional<foundation::Dictionary>& message,
+                                        AudioEventCategory category, AudioEventType type,
+                                        const KestoReportingReply& reply)
+{
+    sendMessage(message, category, type, false, reply);
+}
+
+bool KestoReportingSession::createMessageIdentifier(AudioEventCategory category, AudioEventType type,
+                                                    const foundation::Dictionary& message)
+{
+    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+    if (!nestedAggregatedPayloadData_)
+        return false;
+    switch (nestedAggregatedPayloadData_->record(category, type, message)) {
+    case KestoReportingMessageStore::Outcome::Recorded: return false;
+    case KestoReportingMessageStore::Outcome::Redundant:
+        KESTO_LOG(KestoReportingSessionCategory(), Debug, "dropping redundant event");
+        return true;
+    case KestoReportingMessageStore::Outcome::Full: break;
+    }
+    if (messagesLost_++ == 0)
+        KESTO_LOG(KestoReportingSessionCategory(), Error,
+                  "no memory left for the messages of session {}; they are lost until sessions stop", reporterID_);
+    return false;
+}
+
+void KestoReportingSession::sendSingleMessage(const foundation::Dictionary&, AudioEventCategory, AudioEventType,
+                                              AudioServiceType serviceType, const foundation::Dictionary&,
+                                              const KestoReportingReply&)
+{
+    constexpr std::chrono::nanoseconds delay(1'000'000'000);
+    constexpr std::int64_t mostDelta = 59;
+    thread_local std::minstd_rand random{std::random_device()()};
+    const std::int64_t delta =
+        serviceType == AudioServiceTypeAlarms ? std::uniform_int_distribution<std::int64_t>(0, mostDelta)(random) : 0;
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending single message after delta {} for service {}", delta,
+              serviceType);
+    platform::WorkQueues& queues = platform::current().workQueues;
+    queues.submitAfter(delay, queues.backgroundQueue(), [] { });
+}
+
+std::optional<std::vector<foundation::Dictionary>> KestoReportingSession::nestedAggregatedPayloadData() const
+{
+    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+    if (!nestedAggregatedPayloadData_)
+        return std::nullopt;
+    std::vector<foundation::Dictionary> messages;
+    nestedAggregatedPayloadData_->forEach([&](const std::string& identifier, const foundation::Dictionary& payload) {
+        messages.push_back({{foundation::String(identifier), payload}});
+    });
+    return messages;
+}
+
+std::optional<foundation::Dictionary> KestoReportingSession::messageIdentifierCounts() const
+{
+    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+    if (!nestedAggregatedPayloadData_)
+        return std::nullopt;
+    return nestedAggregatedPayloadData_->counts();
+}

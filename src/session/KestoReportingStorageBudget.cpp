@@ -1,0 +1,27 @@
+#include "session/KestoReportingStorageBudget.h"
+
+const std::shared_ptr<KestoReportingStorageBudget>& KestoReportingStorageBudget::service()
+{
+    static const auto budget = std::make_shared<KestoReportingStorageBudget>(serviceLimit);
+    return budget;
+}
+
+bool KestoReportingStorageBudget::take(std::size_t bytes)
+{
+    std::size_t before = taken_.load(std::memory_order_relaxed);
+    do {
+        if (bytes > limit_ - before)
+            return false;
+    } while (!taken_.compare_exchange_weak(before, before + bytes, std::memory_order_relaxed));
+    if (!enclosing_ || enclosing_->take(bytes))
+        return true;
+    taken_.fetch_sub(bytes, std::memory_order_relaxed);
+    return false;
+}
+
+void KestoReportingStorageBudget::giveBack(std::size_t bytes)
+{
+    taken_.fetch_sub(bytes, std::memory_order_relaxed);
+    if (enclosing_)
+        enclosing_->giveBack(bytes);
+}

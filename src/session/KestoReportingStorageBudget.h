@@ -1,0 +1,36 @@
+// How much memory recorded messages may take: one budget for the service, and within it one a client, so
+// that no client, and not all of them together, can fill the device's memory.
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+
+// Any thread.
+class KestoReportingStorageBudget {
+public:
+    static constexpr std::size_t serviceLimit = std::size_t{2} << 30;
+    static constexpr std::size_t clientLimit = std::size_t{1} << 30;
+
+    // A budget of so many bytes; what is taken from it is taken from `enclosing` too, when there is one.
+    explicit KestoReportingStorageBudget(std::size_t limit,
+                                         std::shared_ptr<KestoReportingStorageBudget> enclosing = nullptr)
+        : limit_(limit),
+          enclosing_(std::move(enclosing))
+    {
+    }
+
+    // The budget of the whole service.
+    static const std::shared_ptr<KestoReportingStorageBudget>& service();
+
+    // False, and nothing taken, when there is not so much left here or in an enclosing budget.
+    [[nodiscard]] bool take(std::size_t bytes);
+    void giveBack(std::size_t bytes);
+    [[nodiscard]] std::size_t taken() const { return taken_.load(std::memory_order_relaxed); }
+
+private:
+    const std::size_t limit_;
+    const std::shared_ptr<KestoReportingStorageBudget> enclosing_;
+    std::atomic<std::size_t> taken_{0};
+};

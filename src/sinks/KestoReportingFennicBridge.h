@@ -1,0 +1,18 @@
+// The bridge to the analytics service: turns a message into events that carry its category and type in
+// their names, one for all services and one for the session's own.
+//
+// Nothing is filtered here. Whether an event is kept is decided by whether somebody wants its name.
+#pragma once
+
+#include "sinks/KestoReportingSinkSession.h"
+
+#include <memory>
+
+// Keeps no state. Any thread.
+class KestoReportingFennicBridge {
+public:
+    // Offers "com.quarn.kesto.<category>.<type>" and "com.quarn.<service>.<category>.<type>", in this order. The
+    // payload is the message as it came, with the session's host application added where it names none.
+    static void handleEvent(const foundation::Dictionary& message, AudioEventCategory category, AudioEventType type,
+                            const std::shared_ptr<const KestoReportingSinkSession>& session);
+};

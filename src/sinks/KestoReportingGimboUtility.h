@@ -1,0 +1,17 @@
+// The power-log sink. It accepts every message and does nothing with it: the entry point is kept so that
+// such a service can be fed without touching the road of a message.
+#pragma once
+
+#include "sinks/KestoReportingSinkSession.h"
+
+#include <memory>
+
+// Keeps no state. Any thread.
+class KestoReportingGimboUtility {
+public:
+    static void handleEvent(const foundation::Dictionary& /*message*/, AudioEventCategory /*category*/,
+                            AudioEventType /*type*/,
+                            const std::shared_ptr<const KestoReportingSinkSession>& /*session*/)
+    {
+    }
+};

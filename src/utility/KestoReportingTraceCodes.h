@@ -1,0 +1,28 @@
+// The codes of the markers that the service leaves in the kernel's trace, so that its own work can be seen
+// between the events of drivers and clients.
+#pragma once
+
+#include "platform/Platform.h"
+
+#include <cstdint>
+
+enum class KestoReportingTraceCode : std::uint32_t {
+    // Operations of a client.
+    ClientCreate = 0x21044814,
+    ClientStart = 0x21044818,
+    ClientStop = 0x2104481C,
+    ClientDestroy = 0x21044820,
+    ClientSendMessage = 0x21044824,
+    // Events of a session.
+    SessionCreated = 0x21044828,
+    SessionStarted = 0x2104482C,
+    SessionStopping = 0x21044830,
+    SessionDestroyed = 0x21044834,
+    SessionMessageAccepted = 0x21044838,
+};
+
+// Leaves the marker, with four zero arguments. Any thread.
+inline void KestoReportingEmitTracePoint(KestoReportingTraceCode code)
+{
+    platform::current().traceMarkers.emit(static_cast<std::uint32_t>(code), {});
+}
