@@ -151,7 +151,7 @@ void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t
         const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false);
         if (!session || session->started() || !delegate)
             return reply(std::nullopt, true);
-        self.start(*delegate, session, reply);
+        start(*delegate, session, reply);
     });
 }
 
@@ -159,6 +159,7 @@ void KestoReportingClientServerInstance::start(KestoReportingServiceDelegateProt
                                                const SuccessReply& reply)
 {
     session->start();
+    session->setDriverSnapShot(delegate.getSnapShot());
     if (const auto& earlier = session->transactionCompleteBlock())
         earlier(std::nullopt, true);
     session->setTransactionCompleteBlock(reply);
@@ -177,17 +178,23 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
         if (reporterID == 0)
             return reply(std::nullopt, true);
         const auto session = self.findReportingSessionForID(reporterID, false);
-        if (session && session->started()) {
-            session->stop();
-            if (const auto complete = session->transactionCompleteBlock())
-                complete(std::nullopt, true);
-            session->setTransactionCompleteBlock(nullptr);
-            if (const auto delegate = self.delegate_.lock())
-                logActiveSessions(*delegate);
-        }
+        const auto delegate = self.delegate_.lock();
+        if (session && session->started() && delegate)
+            stop(*delegate, session);
         KESTO_LOG(KestoReportingClientCategory(), Default, "stopping {}", reporterID);
         reply(std::nullopt, true);
     });
+}
+
+void KestoReportingClientServerInstance::stop(KestoReportingServiceDelegateProtocol& delegate, const Session& session)
+{
+    delegate.sendDriverLogsForSession(session);
+    session->setDriverSnapShot(std::nullopt);
+    session->stop();
+    if (const auto& complete = session->transactionCompleteBlock())
+        complete(std::nullopt, true);
+    session->setTransactionCompleteBlock(nullptr);
+    logActiveSessions(delegate);
 }
 
 void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID, SuccessReply reply)

@@ -12,7 +12,6 @@
 #include "session/KestoReportingStorageBudget.h"
 
 #include <cstdint>
-#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -66,26 +65,30 @@ public:
     void handleConnectionError();
 
 private:
-    // What a message is delivered with.
+    // What is delivered, and the name of the process that sent it.
     struct Message {
         foundation::Dictionary payload;
         AudioEventCategory category;
-        AudioEventType type;
+        std::uint16_t type;
+        std::string processName;
     };
     using Session = std::shared_ptr<KestoReportingSession>;
-    using Delegate = std::shared_ptr<KestoReportingServiceDelegateProtocol>;
 
     // Runs `work(*this)` on the server queue, with this object kept alive.
     template <typename Work> void submit(Work work)
     {
         KestoReportingServerQueue()->submit([self = shared_from_this(), work = std::move(work)] { work(*self); });
     }
-    void start(KestoReportingServiceDelegateProtocol& delegate, const Session& session, const SuccessReply& reply);
-    static void deliverToSinks(const Message& message, const Session& session);
-    static void deliverToSession(const Message& message, const Session& session);
-    void deliverToReporters(const Message& message, const ReporterIDs& reporterIDs) const;
+    static void start(KestoReportingServiceDelegateProtocol& delegate, const Session& session,
+                      const SuccessReply& reply);
+    static void stop(KestoReportingServiceDelegateProtocol& delegate, const Session& session);
+    void deliverToReporters(KestoReportingServiceDelegateProtocol& delegate, const Message& message,
+                            const ReporterIDs& reporterIDs) const;
     static void deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
     static void deliverStandalone(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
+    static void deliverToSinks(KestoReportingServiceDelegateProtocol& delegate, const Message& message,
+                               const Session& session);
+    static void deliverToSession(const Message& message, const Session& session);
     static void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
     void addSession(std::int64_t reporterID, Session session);
     void removeSession(std::int64_t reporterID);

@@ -17,30 +17,35 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
                                                      std::uint16_t type, std::optional<ReporterIDs> reporterIDs,
                                                      KestoReportingReply reply)
 {
-    submit([message = Message{std::move(message), category, type}, reporterIDs = std::move(reporterIDs),
-            reply = std::move(reply)](auto& self) {
+    // The sender is whoever makes this call, which need not be the process that this client was made for.
+    const platform::Connection* caller = platform::Connection::current();
+    auto processName =
+        KestoReportingUtilityProcessNameForPID(caller != nullptr ? caller->processIdentifier() : processIdentifier_);
+    submit([message = Message{std::move(message), category, type, std::move(processName).value_or("")},
+            reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
                   reporterIDs ? fmt::format("[{}]", fmt::join(*reporterIDs, ",")) : "(null)");
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientSendMessage);
         const auto delegate = self.delegate_.lock();
-        if (delegate && !delegate->isReportingEnabled())
+        if (!delegate || !delegate->isReportingEnabled())
             return reply(KestoReportingErrorDisabled);
         if (reporterIDs)
-            self.deliverToReporters(message, *reporterIDs);
-        else if (delegate)
+            self.deliverToReporters(*delegate, message, *reporterIDs);
+        else
             deliverToActiveSessions(*delegate, message);
         reply(std::nullopt);
     });
 }
 
-void KestoReportingClientServerInstance::deliverToReporters(const Message& message,
+void KestoReportingClientServerInstance::deliverToReporters(KestoReportingServiceDelegateProtocol& delegate,
+                                                            const Message& message,
                                                             const ReporterIDs& reporterIDs) const
 {
     for (const std::int64_t reporterID : reporterIDs) {
         const auto session = reporterID == 0 ? nullptr : findReportingSessionForID(reporterID, true);
         if (!session)
             continue;
-        deliverToSinks(message, session);
+        deliverToSinks(delegate, message, session);
         deliverToSession(message, session);
     }
 }
@@ -53,7 +58,7 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(KestoReportingS
               KestoReportingDescriptionOfSessions(active));
     for (const auto& session : active) {
         deliverToSession(message, session);
-        deliverToSinks(message, session);
+        deliverToSinks(delegate, message, session);
     }
     if (active.empty())
         deliverStandalone(delegate, message);
@@ -63,21 +68,24 @@ void KestoReportingClientServerInstance::deliverStandalone(KestoReportingService
                                                            const Message& message)
 {
     constexpr std::int64_t standaloneReporterID = 1;
-    const auto session = std::make_shared<KestoReportingSession>(
-        standaloneReporterID, std::vector{platform::current().processTable.ownProcessIdentifier()});
+    const std::vector ownProcess{platform::current().processTable.ownProcessIdentifier()};
+    const auto session = std::make_shared<KestoReportingSession>(standaloneReporterID, ownProcess);
     session->setServiceType(AudioServiceTypeStandalone);
     session->updateConfigurationWithContentsOfConfiguration(
         foundation::Dictionary{{KestoReportingHostApplicationKey, "Unknown"}});
     session->updateConfigurationWithContentsOfConfiguration(delegate.getDefaults());
-    deliverToSinks(message, session);
+    deliverToSinks(delegate, message, session);
     deliverToSession(message, session);
 }
 
-void KestoReportingClientServerInstance::deliverToSinks(const Message& message, const Session& session)
+void KestoReportingClientServerInstance::deliverToSinks(KestoReportingServiceDelegateProtocol& delegate,
+                                                        const Message& message, const Session& session)
 {
-    KestoReportingFennicBridge::handleEvent(message.payload, message.category, message.type, session);
-    KestoReportingGimboUtility::handleEvent(message.payload, message.category, message.type, session);
-    KestoReportingTrelmBridge::handleEvent(message.payload, message.category, message.type, session);
+    const auto& [payload, category, type, processName] = message;
+    KestoReportingFennicBridge::handleEvent(payload, category, type, session);
+    KestoReportingGimboUtility::handleEvent(payload, category, type, session);
+    KestoReportingTrelmBridge::handleEvent(payload, category, type, session);
+    delegate.handleEventForVorp(payload, category, type, session, processName);
 }
 
 void KestoReportingClientServerInstance::deliverToSession(const Message& message, const Session& session)

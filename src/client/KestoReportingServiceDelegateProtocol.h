@@ -7,6 +7,7 @@
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <string>
 #include <vector>
 
 class KestoReportingClientServerInstance;
@@ -30,7 +31,15 @@ public:
     [[nodiscard]] virtual Sessions getAllActiveReportingSessions() = 0;
     // The session of that ID which belongs to the client registered first, or null. Any thread.
     [[nodiscard]] virtual std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) = 0;
+    // A sample of all audio drivers, by driver.
+    [[nodiscard]] virtual KestoReportingDriverSnapShot getSnapShot() = 0;
+    // Reports to the session what the drivers did since its snapshot.
+    virtual void sendDriverLogsForSession(const std::shared_ptr<KestoReportingSession>& session) = 0;
     virtual void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) = 0;
+    // Offers the message of a process to the bug-capture manager, which only internal builds have.
+    virtual void handleEventForVorp(const foundation::Dictionary& message, AudioEventCategory category,
+                                    std::uint16_t type, const std::shared_ptr<KestoReportingSession>& session,
+                                    const std::string& processName) = 0;
     // A counter that is shown and never changed by the service itself. Any thread.
     [[nodiscard]] virtual std::int64_t activeSessionCount() const = 0;
     virtual void setActiveSessionCount(std::int64_t count) = 0;

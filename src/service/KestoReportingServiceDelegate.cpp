@@ -17,6 +17,9 @@ std::shared_ptr<KestoReportingServiceDelegate> KestoReportingServiceDelegate::ma
     KestoReportingCreateServerQueue();
     std::shared_ptr<KestoReportingServiceDelegate> service(new KestoReportingServiceDelegate);
     service->listenForFeatureStateChanges();
+    service->driverUtility_ = std::make_unique<KestoReportingDriverUtility>();
+    if (KestoReportingUtilityIsInternalBuild())
+        service->vorpStateManager_ = std::make_unique<KestoReportingUtilityVorpStateManager>();
     return service;
 }
 
@@ -43,6 +46,15 @@ foundation::Dictionary KestoReportingServiceDelegate::KestoReportingDefaults()
     const auto disabled = preferences.value(preferencesDomain, disableReportingKey);
     defaults.push_back({disableReportingKey, disabled && disabled->asBoolean() ? 1 : 0});
     return defaults;
+}
+
+void KestoReportingServiceDelegate::handleEventForVorp(const foundation::Dictionary& message,
+                                                       AudioEventCategory category, std::uint16_t type,
+                                                       const std::shared_ptr<KestoReportingSession>& session,
+                                                       const std::string& processName)
+{
+    if (KestoReportingUtilityIsInternalBuild())
+        vorpStateManager_->handleEvent(message, category, type, session, processName);
 }
 
 void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)

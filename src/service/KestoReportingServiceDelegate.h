@@ -5,9 +5,11 @@
 #pragma once
 
 #include "client/KestoReportingServiceDelegateProtocol.h"
+#include "driver/KestoReportingDriverUtility.h"
 #include "foundation/Mutex.h"
 #include "platform/Connection.h"
 #include "service/KestoReportingReporterIndex.h"
+#include "sinks/KestoReportingUtilityVorpStateManager.h"
 
 #include <atomic>
 #include <cstdint>
@@ -43,6 +45,14 @@ public:
     [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
     [[nodiscard]] Sessions getAllActiveReportingSessions() override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
+    [[nodiscard]] KestoReportingDriverSnapShot getSnapShot() override { return driverUtility_->getSnapShot(); }
+    void sendDriverLogsForSession(const std::shared_ptr<KestoReportingSession>& session) override
+    {
+        driverUtility_->sendDriverLogsForSession(session);
+    }
+    void handleEventForVorp(const foundation::Dictionary& message, AudioEventCategory category, std::uint16_t type,
+                            const std::shared_ptr<KestoReportingSession>& session,
+                            const std::string& processName) override;
     void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) override;
     [[nodiscard]] std::int64_t activeSessionCount() const override { return activeSessionCount_; }
     void setActiveSessionCount(std::int64_t count) override { activeSessionCount_ = count; }
@@ -71,8 +81,10 @@ private:
     const bool reportingEnabled_ = true;
     std::atomic<std::int64_t> activeSessionCount_{0};
     Clients clients_;
+    std::unique_ptr<KestoReportingDriverUtility> driverUtility_;
     std::vector<Feature> features_;
     const foundation::Dictionary defaults_;
+    std::unique_ptr<KestoReportingUtilityVorpStateManager> vorpStateManager_; // on internal builds only
 
     foundation::Mutex lock_;
     KestoReportingReporterIndex reporterIndex_ KESTO_GUARDED_BY(lock_);

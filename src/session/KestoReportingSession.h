@@ -7,6 +7,7 @@
 
 #include "foundation/Mutex.h"
 #include "foundation/Value.h"
+#include "session/KestoReportingDriverSnapShot.h"
 #include "session/KestoReportingMessageStore.h"
 #include "sinks/KestoReportingSinkSession.h"
 #include "utility/KestoReportingError.h"
@@ -81,6 +82,13 @@ public:
         transactionCompleteBlock_ = std::move(block);
     }
 
+    // What the drivers' channels held when the session started; set and cleared by the client instance.
+    [[nodiscard]] const std::optional<KestoReportingDriverSnapShot>& driverSnapShot() const { return driverSnapShot_; }
+    void setDriverSnapShot(std::optional<KestoReportingDriverSnapShot> snapShot)
+    {
+        driverSnapShot_ = std::move(snapShot);
+    }
+
     // Asked for by the client; kept for it and never read here.
     [[nodiscard]] bool blinReportingEnabled() const { return blinReportingEnabled_; }
     void setBlinReportingEnabled(bool enabled) { blinReportingEnabled_ = enabled; }
@@ -100,6 +108,7 @@ private:
     bool blinReportingEnabled_ = false;
     std::atomic<AudioServiceType> serviceType_{0};
     foundation::Dictionary configuration_ KESTO_GUARDED_BY(configurationLock_);
+    std::optional<KestoReportingDriverSnapShot> driverSnapShot_;
     KestoReportingResultReply<bool> transactionCompleteBlock_;
     const std::int64_t reporterID_;
     const std::vector<std::int32_t> processIdentifiers_;

@@ -1,0 +1,23 @@
+// One group of driver channels to subscribe to.
+#pragma once
+
+#include <optional>
+#include <string>
+#include <string_view>
+
+struct KestoReportingDriver {
+    std::optional<std::string> groupName;
+    std::optional<std::string> subGroupName;
+
+    // What stands for an absent name, in keys and in the log.
+    static constexpr std::string_view absentName = "(null)";
+
+    // "group-subgroup"; the key of this driver in snapshots.
+    [[nodiscard]] std::string description() const
+    {
+        std::string text(groupName ? *groupName : absentName);
+        text += '-';
+        text += subGroupName ? *subGroupName : absentName;
+        return text;
+    }
+};

@@ -1,0 +1,33 @@
+// Watches for haptics hardware that keeps running: when a second, different report of haptic hardware time comes
+// after a first one, a session has probably leaked, and the bug-capture service is asked for a snapshot.
+#pragma once
+
+#include "platform/BugCapture.h"
+#include "sinks/KestoReportingSinkSession.h"
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <string_view>
+
+// Has no lock: its callers hand it one message at a time.
+class KestoReportingUtilityVorpStateManager {
+public:
+    // A message of a session, sent by a process of that name. No message is ignored.
+    void handleEvent(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
+                     AudioEventType type, const std::shared_ptr<const KestoReportingSinkSession>& session,
+                     std::string_view processName);
+
+    // How many distinct reports were counted since the last snapshot: 0 or 1.
+    [[nodiscard]] std::uint64_t leakedHapticsSessionCounter() const { return leakedHapticsSessionCounter_; }
+    // The report counted last.
+    [[nodiscard]] const foundation::Dictionary& messageCache() const { return messageCache_; }
+
+private:
+    void requestSnapshot(AudioEventCategory category, const KestoReportingSinkSession& session,
+                         std::string_view processName);
+
+    std::uint64_t leakedHapticsSessionCounter_ = 0;
+    foundation::Dictionary messageCache_;
+    std::unique_ptr<platform::BugCaptureReporter> ulmetReporter_; // of the snapshot requested last
+};
