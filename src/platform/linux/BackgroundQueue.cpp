@@ -1,0 +1,64 @@
+#include "platform/linux/BackgroundQueue.h"
+
+#include "platform/linux/Thread.h"
+
+#include <utility>
+
+namespace platform {
+namespace {
+
+thread_local const BackgroundQueue* queueOfThisThread = nullptr;
+
+} // namespace
+
+BackgroundQueue::~BackgroundQueue()
+{
+    std::vector<std::thread> threads;
+    {
+        const foundation::Lock lock(lock_);
+        isEnding_ = true;
+        threads.swap(threads_);
+        changed_.notifyAll();
+    }
+    for (std::thread& thread : threads)
+        thread.join();
+}
+
+void BackgroundQueue::submit(WorkItem item)
+{
+    const foundation::Lock lock(lock_);
+    waiting_.push_back(std::move(item));
+    if (freeThreads_ < waiting_.size() && threads_.size() < mostThreads && !isEnding_)
+        threads_.push_back(startThread("background", QualityOfService::Background, [this] { run(); }));
+    else
+        changed_.notifyOne();
+}
+
+bool BackgroundQueue::isCurrent() const
+{
+    return queueOfThisThread == this;
+}
+
+void BackgroundQueue::run()
+{
+    queueOfThisThread = this;
+    while (WorkItem item = take())
+        item();
+}
+
+// The next item; an empty one when there will be none.
+WorkItem BackgroundQueue::take()
+{
+    const foundation::Lock lock(lock_);
+    ++freeThreads_;
+    while (waiting_.empty() && !isEnding_)
+        changed_.wait(lock_);
+    --freeThreads_;
+    if (waiting_.empty())
+        return nullptr;
+    WorkItem item = std::move(waiting_.front());
+    waiting_.pop_front();
+    return item;
+}
+
+} // namespace platform

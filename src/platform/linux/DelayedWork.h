@@ -1,0 +1,45 @@
+// Work that starts later: a thread, started on first use, that sleeps until the next item is due and then
+// gives it to the queue on which it is to run.
+#pragma once
+
+#include "foundation/Mutex.h"
+#include "platform/WorkQueue.h"
+
+#include <chrono>
+#include <map>
+#include <thread>
+
+namespace platform {
+
+// Any thread.
+class DelayedWork {
+public:
+    using Clock = std::chrono::steady_clock;
+
+    DelayedWork() = default;
+    // What is not due yet is dropped.
+    ~DelayedWork();
+    DelayedWork(const DelayedWork&) = delete;
+    DelayedWork& operator=(const DelayedWork&) = delete;
+
+    // Submits the item to the queue, which still exists then, at that time or soon after.
+    void add(Clock::time_point due, WorkQueue& queue, WorkItem item);
+
+private:
+    struct Delayed {
+        WorkQueue& queue;
+        WorkItem item;
+    };
+    using Schedule = std::multimap<Clock::time_point, Delayed>; // of equal times, the first added comes first
+
+    void run();
+    [[nodiscard]] Schedule::node_type waitForDue();
+
+    foundation::Mutex lock_;
+    foundation::Condition changed_;
+    Schedule schedule_ KESTO_GUARDED_BY(lock_);
+    bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
+    std::thread thread_ KESTO_GUARDED_BY(lock_);
+};
+
+} // namespace platform

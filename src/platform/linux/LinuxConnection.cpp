@@ -1,0 +1,317 @@
+#include "platform/linux/LinuxConnection.h"
+
+#include "platform/linux/Outbox.h"
+#include "platform/linux/SerialQueue.h"
+
+#include <cerrno>
+#include <fmt/format.h>
+#include <sys/epoll.h>
+#include <sys/socket.h>
+#include <system_error>
+#include <utility>
+
+namespace platform {
+namespace {
+
+std::string systemErrorText(int error)
+{
+    return std::generic_category().message(error);
+}
+
+// Both counts in one number, so that exactly one thread sees them fall below the limits.
+constexpr std::uint64_t unansweredCall(std::size_t bytes) noexcept
+{
+    return std::uint64_t{1} << 32 | bytes;
+}
+
+constexpr bool areTooManyUnanswered(std::uint64_t unanswered) noexcept
+{
+    return unanswered >> 32 > LinuxConnection::mostUnansweredCalls
+        || (unanswered & 0xFFFFFFFF) > LinuxConnection::mostUnansweredBytes;
+}
+
+} // namespace
+
+// What a call holds until it is answered.
+class LinuxConnection::Credit {
+public:
+    Credit(std::shared_ptr<LinuxConnection> connection, std::size_t bytes) noexcept
+        : connection_(std::move(connection)), bytes_(bytes)
+    {
+    }
+    ~Credit() { connection_->returnCredit(bytes_); }
+    Credit(const Credit&) = delete;
+    Credit& operator=(const Credit&) = delete;
+
+private:
+    const std::shared_ptr<LinuxConnection> connection_;
+    const std::size_t bytes_;
+};
+
+LinuxConnection::LinuxConnection(std::shared_ptr<ConnectionHub> hub, FileDescriptor socket, Peer peer)
+    : hub_(std::move(hub)), peer_(peer), socket_(std::move(socket))
+{
+}
+
+std::string LinuxConnection::description() const
+{
+    return fmt::format("connection of process {} (user {})", peer_.processIdentifier, peer_.userIdentifier);
+}
+
+void LinuxConnection::resume()
+{
+    const foundation::Lock lock(lock_);
+    epoll_event event = {};
+    event.events = watchedEvents_ = EPOLLIN | EPOLLRDHUP;
+    event.data.ptr = this;
+    isResumed_ = ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_ADD, socket_.get(), &event) == 0;
+    if (!isResumed_)
+        breakReason_ = systemErrorText(errno);
+}
+
+bool LinuxConnection::handle(std::uint32_t events)
+{
+    if ((events & EPOLLOUT) != 0) {
+        const foundation::Lock lock(lock_);
+        writeOutput();
+    }
+    if (!endIfBroken() && (events & ~EPOLLOUT) != 0) {
+        read();
+        (void)endIfBroken();
+    }
+    const foundation::Lock lock(lock_);
+    return !isOver_;
+}
+
+// Whether it is over.
+bool LinuxConnection::endIfBroken()
+{
+    std::optional<std::string> reason;
+    {
+        const foundation::Lock lock(lock_);
+        if (isOver_ || !breakReason_)
+            return isOver_;
+        reason = breakReason_;
+    }
+    end(std::move(reason));
+    return true;
+}
+
+// One read, so that every client gets its turn. It happens also when the client is behind but gone: what it
+// left in the socket has an end, and the connection would otherwise never get to see it.
+void LinuxConnection::read()
+{
+    auto& buffer = hub_->readBuffer;
+    const ssize_t count = ::recv(socket_.get(), buffer.data(), buffer.size(), MSG_DONTWAIT);
+    if (count > 0)
+        takeIn({buffer.data(), static_cast<std::size_t>(count)});
+    else if (count == 0)
+        endOfStream();
+    else if (errno != EAGAIN && errno != EINTR)
+        breakOff(systemErrorText(errno));
+}
+
+void LinuxConnection::endOfStream()
+{
+    bool wasReset = false;
+    {
+        const foundation::Lock lock(lock_);
+        wasReset = wasReset_;
+    }
+    if (wasReset)
+        breakOff(systemErrorText(ECONNRESET));
+    else if (reader_.isInsideFrame())
+        breakOff("the stream ends inside a frame");
+    else
+        end(std::nullopt);
+}
+
+// Everything is decoded before anything is delivered: delivering alone is so quick that the queue which the
+// calls go to wakes up once and finds them all.
+void LinuxConnection::takeIn(std::string_view bytes)
+{
+    reader_.feed(bytes);
+    const auto decoded = decodeFrames();
+    const auto delivered = deliverCalls();
+    if (!delivered)
+        breakOff(delivered.error().reason);
+    else if (!decoded)
+        breakOff(decoded.error().reason);
+    const foundation::Lock lock(lock_);
+    watch();
+}
+
+std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
+{
+    while (true) {
+        const auto frame = reader_.next();
+        if (!frame)
+            return std::unexpected(Violation{fmt::format("a frame is longer than {} bytes", longestFrame)});
+        if (!*frame)
+            return {};
+        const auto value = decoder_.decode(**frame);
+        if (!value)
+            return std::unexpected(Violation{std::string(foundation::description(value.error()))});
+        auto array = value->array();
+        if (!array)
+            return std::unexpected(Violation{"a frame is not an array"});
+        const std::size_t size = (*frame)->size();
+        unanswered_.fetch_add(unansweredCall(size));
+        hub_->calls.push_back({*std::move(array), std::make_shared<Credit>(shared_from_this(), size)});
+    }
+}
+
+std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
+{
+    const CallScope scope(*this);
+    std::expected<void, Violation> result;
+    for (Call& call : hub_->calls) {
+        result = callHandler_(std::move(call));
+        if (!result)
+            break;
+    }
+    hub_->calls.clear();
+    return result;
+}
+
+void LinuxConnection::returnCredit(std::size_t bytes)
+{
+    const std::uint64_t before = unanswered_.fetch_sub(unansweredCall(bytes));
+    if (!areTooManyUnanswered(before) || areTooManyUnanswered(before - unansweredCall(bytes)))
+        return;
+    const foundation::Lock lock(lock_);
+    watch();
+}
+
+void LinuxConnection::send(std::string frame)
+{
+    const std::size_t size = frameHeadSize + frame.size();
+    const std::size_t unsent = unsentBytes_.fetch_add(size) + size;
+    if (frame.size() > longestFrame)
+        breakOff("an answer is longer than a frame may be");
+    else if (unsent > mostUnsentBytes)
+        breakOff("it does not read its answers");
+    else if (SerialQueue::isTurnRunning())
+        return Outbox::gather(shared_from_this(), frame);
+    else {
+        std::string frames;
+        appendFrame(frame, frames);
+        return write(std::move(frames));
+    }
+    drop(size);
+}
+
+void LinuxConnection::write(std::string frames)
+{
+    const foundation::Lock lock(lock_);
+    if (isOver_ || breakReason_ || cannotSend_)
+        return drop(frames.size());
+    if (!output_.empty()) {
+        output_ += frames; // behind what waits for room already
+        return;
+    }
+    output_ = std::move(frames);
+    writeOutput();
+}
+
+// Gives the socket what it takes.
+void LinuxConnection::writeOutput()
+{
+    if (isOver_ || output_.empty())
+        return;
+    const std::string_view rest = std::string_view(output_).substr(outputStart_);
+    const ssize_t count = ::send(socket_.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    if (count >= 0) {
+        unsentBytes_ -= static_cast<std::size_t>(count);
+        outputStart_ += static_cast<std::size_t>(count);
+    } else if (errno != EAGAIN && errno != EINTR) { // reading goes on: what the peer sent before is still there
+        cannotSend_ = true;
+        wasReset_ = errno == ECONNRESET;
+        dropOutput();
+    }
+    if (outputStart_ == output_.size()) {
+        output_ = std::string(); // rather than clear: an idle connection keeps no buffer
+        outputStart_ = 0;
+    } else if (outputStart_ > output_.size() / 2) { // so that moving costs less than sending did
+        output_.erase(0, outputStart_);
+        outputStart_ = 0;
+    }
+    watch();
+}
+
+void LinuxConnection::dropOutput()
+{
+    drop(output_.size() - outputStart_);
+    output_ = std::string();
+    outputStart_ = 0;
+}
+
+void LinuxConnection::drop(std::size_t bytes)
+{
+    unsentBytes_ -= bytes;
+    hub_->counters.droppedBytes += bytes;
+}
+
+bool LinuxConnection::isBehind() const noexcept
+{
+    return areTooManyUnanswered(unanswered_) || unsentBytes_ > manyUnsentBytes;
+}
+
+// Has the socket watched for what can be done with it now. Everyone who changes what it depends on calls it
+// afterwards; whoever comes last sees all changes.
+void LinuxConnection::watch()
+{
+    if (!isResumed_ || isOver_)
+        return;
+    epoll_event event = {};
+    event.events = EPOLLRDHUP;
+    if (!isBehind())
+        event.events |= EPOLLIN;
+    if (!output_.empty())
+        event.events |= EPOLLOUT;
+    if (event.events == watchedEvents_)
+        return;
+    if ((watchedEvents_ & ~event.events & EPOLLIN) != 0)
+        ++hub_->counters.readingPauses;
+    watchedEvents_ = event.events;
+    event.data.ptr = this;
+    ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_MOD, socket_.get(), &event);
+}
+
+// Marks the connection as broken. The connection thread ends it, woken by the shutdown.
+void LinuxConnection::breakOff(std::string reason)
+{
+    const foundation::Lock lock(lock_);
+    if (isOver_ || breakReason_)
+        return;
+    breakReason_ = std::move(reason);
+    ::shutdown(socket_.get(), SHUT_RDWR);
+}
+
+void LinuxConnection::end(std::optional<std::string> interruptedBecause)
+{
+    {
+        const foundation::Lock lock(lock_);
+        if (isOver_)
+            return;
+        isOver_ = true;
+        dropOutput();
+        if (isResumed_) // closing does not suffice when a child process happens to hold a copy
+            ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_DEL, socket_.get(), nullptr);
+        socket_ = FileDescriptor();
+    }
+    // The handlers go with the connection: they may hold it.
+    callHandler_ = nullptr;
+    EndHandler interrupted = std::exchange(interruptionHandler_, nullptr);
+    EndHandler invalidated = std::exchange(invalidationHandler_, nullptr);
+    if (interruptedBecause) {
+        ++hub_->counters.interrupted;
+        KESTO_LOG(hub_->log, Default, "{} ends: {}", description(), *interruptedBecause);
+        if (interrupted)
+            interrupted();
+    }
+    if (invalidated)
+        invalidated();
+}
+
+} // namespace platform
