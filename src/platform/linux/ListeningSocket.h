@@ -46,7 +46,12 @@ public:
     [[nodiscard]] static Result bind(std::filesystem::path path, unsigned permissions = everyone);
 
     ListeningSocket(ListeningSocket&&) noexcept = default;
-    ListeningSocket& operator=(ListeningSocket&&) = delete;
+    ListeningSocket& operator=(ListeningSocket&& other) noexcept
+    {
+        std::swap(descriptor_, other.descriptor_);
+        std::swap(boundPath_, other.boundPath_);
+        return *this;
+    }
     ~ListeningSocket();
 
     [[nodiscard]] int descriptor() const noexcept { return descriptor_.get(); }
