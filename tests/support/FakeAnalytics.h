@@ -1,0 +1,54 @@
+// An analytics service that keeps what it is sent. It is as lazy as a service may be: a payload is built when the
+// test looks at it, and never before.
+#pragma once
+
+#include "foundation/Mutex.h"
+#include "platform/Analytics.h"
+
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace support {
+
+struct AnalyticsEvent {
+    std::string name;
+    foundation::Dictionary payload;
+    friend bool operator==(const AnalyticsEvent&, const AnalyticsEvent&) = default;
+};
+void PrintTo(const AnalyticsEvent& event, std::ostream* out);
+
+// Any thread.
+class FakeAnalytics final : public platform::Analytics {
+public:
+    // From now on events whose name matches the glob are wanted; none is at first.
+    void use(std::string pattern);
+
+    // The names asked about, and those of the events sent, in order. Builds nothing.
+    [[nodiscard]] std::vector<std::string> asked() const;
+    [[nodiscard]] std::vector<std::string> sent() const;
+    // The events sent, their payloads built now unless they were before; of one name in the second form.
+    [[nodiscard]] std::vector<AnalyticsEvent> events();
+    [[nodiscard]] std::vector<foundation::Dictionary> payloads(std::string_view name);
+    // How many payloads were built.
+    [[nodiscard]] int timesBuilt() const;
+    // Forgets everything but what is wanted, and lets go of the payloads not built.
+    void clear();
+
+    bool isAnalyticsEventUsed(std::string_view eventName) override;
+    void sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder) override;
+
+private:
+    struct Sent {
+        std::string name;
+        PayloadBuilder builder;
+        std::optional<foundation::Dictionary> payload;
+    };
+    mutable foundation::Mutex lock_;
+    std::vector<std::string> used_ KESTO_GUARDED_BY(lock_);
+    std::vector<std::string> asked_ KESTO_GUARDED_BY(lock_);
+    std::vector<Sent> sent_ KESTO_GUARDED_BY(lock_);
+    int timesBuilt_ KESTO_GUARDED_BY(lock_) = 0;
+};
+
+} // namespace support

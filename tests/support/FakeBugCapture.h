@@ -1,0 +1,62 @@
+// A bug-capture service that keeps the snapshots it is asked for, and answers when the test says so.
+#pragma once
+
+#include "platform/BugCapture.h"
+
+#include <vector>
+
+namespace support {
+
+// One thread.
+class FakeBugCapture final : public platform::BugCapture {
+public:
+    struct Snapshot {
+        foundation::Dictionary signature;
+        double duration = 0;
+        std::optional<foundation::Value> event;
+        std::optional<foundation::Value> payload;
+        platform::BugCaptureReporter::Reply reply;
+    };
+
+    // The snapshots asked for, in order; `snapshots()[0].reply(...)` answers one.
+    [[nodiscard]] std::vector<Snapshot>& snapshots() { return snapshots_; }
+    [[nodiscard]] int reportersMade() const { return reportersMade_; }
+
+    std::unique_ptr<platform::BugCaptureReporter> makeReporter() override
+    {
+        ++reportersMade_;
+        return std::make_unique<Reporter>(snapshots_);
+    }
+
+private:
+    class Reporter final : public platform::BugCaptureReporter {
+    public:
+        explicit Reporter(std::vector<Snapshot>& snapshots) : snapshots_(snapshots) { }
+
+        foundation::Dictionary makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
+                                             std::string_view subtypeContext, std::string_view detectedProcess,
+                                             const std::optional<foundation::Value>& triggerThresholdValues) override
+        {
+            return {{"domain", domain},
+                    {"type", type},
+                    {"subType", subType},
+                    {"subtypeContext", subtypeContext},
+                    {"detectedProcess", detectedProcess},
+                    {"triggerThresholdValues", triggerThresholdValues.value_or(foundation::Value())}};
+        }
+        void requestSnapshot(foundation::Dictionary signature, double duration,
+                             const std::optional<foundation::Value>& event,
+                             const std::optional<foundation::Value>& payload, Reply reply) override
+        {
+            snapshots_.push_back({std::move(signature), duration, event, payload, std::move(reply)});
+        }
+
+    private:
+        std::vector<Snapshot>& snapshots_;
+    };
+
+    std::vector<Snapshot> snapshots_;
+    int reportersMade_ = 0;
+};
+
+} // namespace support

@@ -1,0 +1,78 @@
+#include "support/FakeConnection.h"
+
+#include <algorithm>
+#include <gtest/gtest.h>
+#include <utility>
+
+namespace support {
+
+using foundation::Array;
+using foundation::Value;
+
+std::expected<void, platform::Connection::Violation> FakeConnection::call(Array frame)
+{
+    EXPECT_TRUE(isResumed_ && !isOver_) << "no call reaches a service that does not read";
+    std::string bytes;
+    foundation::appendCbor(Value(std::move(frame)), bytes);
+    const auto credit = std::make_shared<char>();
+    credits_.push_back(credit);
+    auto result = callHandler_({decoded(bytes), credit});
+    if (!result)
+        breakOff();
+    return result;
+}
+
+std::size_t FakeConnection::unansweredCalls() const
+{
+    return static_cast<std::size_t>(
+        std::ranges::count_if(credits_, [](const auto& credit) { return !credit.expired(); }));
+}
+
+void FakeConnection::close()
+{
+    if (std::exchange(isOver_, true))
+        return;
+    invalidationHandler_();
+    callHandler_ = nullptr; // nothing follows, so nothing is held any more
+    interruptionHandler_ = nullptr;
+    invalidationHandler_ = nullptr;
+}
+
+void FakeConnection::breakOff()
+{
+    interrupt();
+    close();
+}
+
+void FakeConnection::interrupt()
+{
+    if (!isOver_ && !std::exchange(isInterrupted_, true))
+        interruptionHandler_();
+}
+
+std::string FakeConnection::description() const
+{
+    return "connection of process " + std::to_string(processIdentifier_);
+}
+
+void FakeConnection::send(std::string frame)
+{
+    if (!isOver_)
+        received_.push_back(decoded(frame));
+}
+
+Array FakeConnection::decoded(const std::string& frame)
+{
+    const auto value = decoder_.decode(frame);
+    EXPECT_TRUE(value && value->array()) << "a frame is an array";
+    return value ? value->array().value_or(Array()) : Array();
+}
+
+std::shared_ptr<FakeConnection> FakeConnectionListener::connect(std::int32_t processIdentifier)
+{
+    auto connection = std::make_shared<FakeConnection>(processIdentifier);
+    EXPECT_TRUE(delegate_->shouldAcceptNewConnection(*this, connection)) << "connections are never refused";
+    return connection;
+}
+
+} // namespace support

@@ -1,0 +1,90 @@
+// Files that exist only in a test's memory: those of the file system and those of the performance-data writer.
+#pragma once
+
+#include "platform/FileSystem.h"
+#include "platform/PerformanceWriter.h"
+
+#include <map>
+#include <string>
+#include <vector>
+
+namespace support {
+
+// One thread, as is the other.
+class FakeFileSystem final : public platform::FileSystem {
+public:
+    std::map<std::filesystem::path, unsigned> directories; // with their permissions
+    std::map<std::filesystem::path, std::string> files;
+    std::error_code directoryError; // of the next attempts, unless it is none
+    std::error_code writeError;
+
+    [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return "/diagnostics"; }
+    std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
+                                                           unsigned permissions) override
+    {
+        if (directoryError)
+            return std::unexpected(directoryError);
+        directories.try_emplace(path, permissions);
+        return {};
+    }
+    std::expected<void, std::error_code> writeAtomically(const std::filesystem::path& path,
+                                                         std::string_view text) override
+    {
+        if (writeError)
+            return std::unexpected(writeError);
+        files.insert_or_assign(path, std::string(text));
+        return {};
+    }
+};
+
+class FakePerformanceWriter final : public platform::PerformanceWriter {
+public:
+    struct Measurement {
+        std::string name;
+        double value;
+        platform::PerformanceUnit unit;
+        friend bool operator==(const Measurement&, const Measurement&) = default;
+    };
+    struct File {
+        std::filesystem::path path;
+        std::string project;
+        std::uint32_t version = 0;
+        std::vector<Measurement> measurements;
+        bool closed = false;
+    };
+
+    bool canOpen = true;
+
+    // The files that were opened, in order.
+    [[nodiscard]] const std::vector<std::shared_ptr<File>>& files() const { return files_; }
+
+    std::unique_ptr<platform::PerformanceFile> open(const std::filesystem::path& path, std::string_view project,
+                                                    std::uint32_t version) override
+    {
+        if (!canOpen)
+            return nullptr;
+        return std::make_unique<Handle>(
+            files_.emplace_back(std::make_shared<File>(path, std::string(project), version)));
+    }
+
+private:
+    class Handle final : public platform::PerformanceFile {
+    public:
+        explicit Handle(std::shared_ptr<File> file) : file_(std::move(file)) { }
+        ~Handle() override { file_->closed = true; }
+        Handle(const Handle&) = delete;
+        Handle& operator=(const Handle&) = delete;
+
+        void write(std::string_view name, double value, platform::PerformanceUnit unit) override
+        {
+            file_->measurements.push_back({std::string(name), value, unit});
+        }
+
+    private:
+        const std::shared_ptr<File> file_;
+    };
+
+    std::vector<std::shared_ptr<File>> files_;
+};
+
+} // namespace support

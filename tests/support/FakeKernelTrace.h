@@ -1,0 +1,46 @@
+// A kernel trace whose events the test makes up. One nanosecond a unit of time.
+#pragma once
+
+#include "platform/KernelTrace.h"
+
+#include <string>
+#include <vector>
+
+namespace support {
+
+// One thread.
+class FakeKernelTrace final : public platform::KernelTrace {
+public:
+    struct Filter {
+        std::uint32_t firstCode;
+        std::uint32_t lastCode;
+        std::function<void(const platform::KernelTraceEvent&)> handler;
+    };
+    // What became of one session; stays when the session itself is gone.
+    struct Session {
+        bool wallTimes = false;
+        bool started = false;
+        bool ended = false;
+        std::vector<Filter> filters;
+        std::function<void()> completion;
+        std::shared_ptr<platform::WorkQueue> queue;
+    };
+
+    // Whether this system can trace at all, and the error numbers of the two steps that can fail.
+    bool available = true;
+    int filterError = 0;
+    int startError = 0;
+
+    // The sessions that were made, in order.
+    [[nodiscard]] const std::vector<std::shared_ptr<Session>>& sessions() const { return sessions_; }
+    // Delivers the event to every running session that filters for its code.
+    void deliver(const platform::KernelTraceEvent& event);
+
+    std::unique_ptr<platform::KernelTraceSession> createTraceSession() override;
+
+private:
+    class Handle;
+    std::vector<std::shared_ptr<Session>> sessions_;
+};
+
+} // namespace support

@@ -1,0 +1,58 @@
+// A log that keeps its lines, so that tests check what was said, how loudly, and in which order.
+#pragma once
+
+#include "foundation/Mutex.h"
+#include "platform/Log.h"
+
+#include <functional>
+#include <gmock/gmock.h>
+#include <iosfwd>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace support {
+
+struct LogLine {
+    platform::LogLevel level;
+    std::string tag;
+    std::string message;
+    std::string subsystem;
+    std::string file; // of the statement
+    int line;
+};
+void PrintTo(const LogLine& line, std::ostream* out);
+
+// Any thread.
+class FakeLog final : public platform::Log {
+public:
+    // Everything is let through unless told otherwise before the first statement.
+    void setThreshold(platform::LogLevel level) { threshold_ = level; }
+    // Is told every line as it comes. For those who cannot look later, such as death tests.
+    void setObserver(std::function<void(const LogLine&)> observer) { observer_ = std::move(observer); }
+
+    [[nodiscard]] std::vector<LogLine> lines() const;
+    [[nodiscard]] std::vector<LogLine> lines(std::string_view tag) const;
+    // The lines since the last time.
+    std::vector<LogLine> take();
+    void clear() { take(); }
+
+    [[nodiscard]] platform::LogLevel threshold(const platform::LogCategory&) const override { return threshold_; }
+    void write(const platform::LogRecord& record) override;
+
+private:
+    platform::LogLevel threshold_ = platform::LogLevel::Debug;
+    std::function<void(const LogLine&)> observer_;
+    mutable foundation::Mutex lock_;
+    std::vector<LogLine> lines_ KESTO_GUARDED_BY(lock_);
+};
+
+// Matches a line of that level, tag and text.
+inline auto IsLine(platform::LogLevel level, std::string_view tag, std::string_view message)
+{
+    return testing::AllOf(testing::Field("level", &LogLine::level, level),
+                          testing::Field("tag", &LogLine::tag, std::string(tag)),
+                          testing::Field("message", &LogLine::message, std::string(message)));
+}
+
+} // namespace support

@@ -1,0 +1,46 @@
+// System notifications that a test posts, with states that it sets.
+#pragma once
+
+#include "platform/Notifications.h"
+
+#include <map>
+#include <string>
+#include <vector>
+
+namespace support {
+
+// One thread.
+class FakeNotifications final : public platform::Notifications {
+public:
+    static constexpr platform::NotificationStatus unreadable = 7;
+
+    // Gives the name a state that can be read.
+    void setState(std::string name, std::uint64_t state) { states_.insert_or_assign(std::move(name), state); }
+    void removeState(const std::string& name) { states_.erase(name); }
+    // Submits the handlers of the name to their queues.
+    void post(std::string_view name);
+    // Makes registrations of the name fail with that status.
+    void failRegistration(std::string name, platform::NotificationStatus status)
+    {
+        failures_.insert_or_assign(std::move(name), status);
+    }
+
+    // The names that were registered; a registration's token is its place here, from 1.
+    [[nodiscard]] std::vector<std::string> registered() const;
+
+    Registration registerNotification(std::string_view name, std::shared_ptr<platform::WorkQueue> queue,
+                                      Handler handler) override;
+    [[nodiscard]] std::expected<std::uint64_t, platform::NotificationStatus> state(std::int32_t token) const override;
+
+private:
+    struct Registered {
+        std::string name;
+        std::shared_ptr<platform::WorkQueue> queue;
+        Handler handler;
+    };
+    std::vector<Registered> registered_;
+    std::map<std::string, std::uint64_t, std::less<>> states_;
+    std::map<std::string, platform::NotificationStatus, std::less<>> failures_;
+};
+
+} // namespace support

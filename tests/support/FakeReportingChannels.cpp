@@ -1,0 +1,115 @@
+#include "support/FakeReportingChannels.h"
+
+#include <algorithm>
+#include <tuple>
+
+namespace support {
+
+using platform::ReportingChannel;
+using platform::ReportingSample;
+
+// A channel set is the question that found it.
+struct FakeReportingChannels::Selection final : ChannelSet {
+    Selection(Name givenGroup, Name givenSubgroup)
+        : group(std::move(givenGroup)),
+          subgroup(std::move(givenSubgroup)) { }
+    Name group;
+    Name subgroup;
+};
+
+namespace {
+
+bool isSameChannel(const ReportingChannel& left, const ReportingChannel& right)
+{
+    const auto identity = [](const ReportingChannel& channel) {
+        return std::tie(channel.driver, channel.group, channel.subgroup, channel.name);
+    };
+    return identity(left) == identity(right);
+}
+
+void subtract(ReportingChannel& channel, const ReportingChannel& earlier)
+{
+    channel.value -= earlier.value;
+    for (std::size_t place = 0; place < std::min(channel.buckets.size(), earlier.buckets.size()); ++place)
+        channel.buckets[place].hits -= earlier.buckets[place].hits;
+    double residency = 0;
+    for (std::size_t place = 0; place < std::min(channel.states.size(), earlier.states.size()); ++place) {
+        channel.states[place].transitions -= earlier.states[place].transitions;
+        channel.states[place].residency -= earlier.states[place].residency;
+        residency += static_cast<double>(channel.states[place].residency);
+    }
+    for (auto& state : channel.states)
+        state.dutyCycle = residency == 0 ? 0 : static_cast<double>(state.residency) / residency;
+}
+
+} // namespace
+
+void FakeReportingChannels::publish(ReportingChannel channel)
+{
+    const auto found =
+        std::ranges::find_if(channels_, [&](const auto& other) { return isSameChannel(other, channel); });
+    if (found == channels_.end())
+        channels_.push_back(std::move(channel));
+    else
+        *found = std::move(channel);
+}
+
+std::vector<ReportingChannel> FakeReportingChannels::select(const ChannelSet& channels) const
+{
+    const auto& [group, subgroup] = dynamic_cast<const Selection&>(channels);
+    std::vector<ReportingChannel> selected;
+    for (const auto& channel : channels_)
+        if ((!group || channel.group == group) && (!subgroup || channel.subgroup == subgroup))
+            selected.push_back(channel);
+    return selected;
+}
+
+platform::ReportingChannels::FoundChannels
+FakeReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group,
+                                           std::optional<std::string_view> subgroup)
+{
+    const auto selection = std::make_shared<Selection>(Name(group), Name(subgroup));
+    const Failures& failing = failures(selection->group, selection->subgroup);
+    asked_.emplace_back(selection->group, selection->subgroup);
+    if (failing.copy && !failing.copiesAnyway)
+        return {.channels = nullptr, .error = failing.copy};
+    return {.channels = selection, .error = failing.copy};
+}
+
+std::size_t FakeReportingChannels::channelCount(const ChannelSet& channels) const
+{
+    return select(channels).size();
+}
+
+platform::ReportingChannels::Subscribed FakeReportingChannels::createSubscription(const ChannelSet& channels)
+{
+    const auto& selection = dynamic_cast<const Selection&>(channels);
+    auto subscription = std::make_shared<Subscription>();
+    if (const auto error = failures(selection.group, selection.subgroup).subscription)
+        return {.subscription = std::move(subscription), .channels = nullptr, .error = error};
+    return {.subscription = std::move(subscription), .channels = std::make_shared<Selection>(selection), .error = {}};
+}
+
+std::expected<ReportingSample, platform::ReportingChannelError>
+FakeReportingChannels::createSamples(const Subscription&, const ChannelSet& channels)
+{
+    const auto& selection = dynamic_cast<const Selection&>(channels);
+    if (const auto error = failures(selection.group, selection.subgroup).sample)
+        return std::unexpected(*error);
+    return ReportingSample{select(channels)};
+}
+
+std::expected<ReportingSample, platform::ReportingChannelError>
+FakeReportingChannels::createDifference(const ReportingSample& from, const ReportingSample& to)
+{
+    if (differenceError_)
+        return std::unexpected(*differenceError_);
+    ReportingSample difference = to;
+    for (auto& channel : difference.channels)
+        for (const auto& earlier : from.channels)
+            if (isSameChannel(channel, earlier))
+                subtract(channel, earlier);
+    return difference;
+}
+
+} // namespace support

@@ -1,0 +1,58 @@
+// Reporting channels that a test publishes and changes, with failures where it wants them.
+#pragma once
+
+#include "platform/ReportingChannels.h"
+
+#include <map>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace support {
+
+// One thread.
+class FakeReportingChannels final : public platform::ReportingChannels {
+public:
+    using Name = std::optional<std::string>;
+    using Error = platform::ReportingChannelError;
+
+    // What goes wrong for one group and subgroup, as they are asked for.
+    struct Failures {
+        std::optional<Error> copy;
+        bool copiesAnyway = false; // channels come back beside the error
+        std::optional<Error> subscription;
+        std::optional<Error> sample;
+    };
+
+    // Puts the channel in place of the one of the same driver, group, subgroup and name, or adds it.
+    void publish(platform::ReportingChannel channel);
+    void withdrawAll() { channels_.clear(); }
+    Failures& failures(Name group, Name subgroup) { return failures_[{std::move(group), std::move(subgroup)}]; }
+    void failDifferences(std::optional<Error> error) { differenceError_ = error; }
+
+    // The groups and subgroups that were asked for, in order.
+    [[nodiscard]] const std::vector<std::pair<Name, Name>>& asked() const { return asked_; }
+
+    // No channel set comes back for an error; one without channels for a group that nobody publishes.
+    FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
+                                      std::optional<std::string_view> subgroup) override;
+    [[nodiscard]] std::size_t channelCount(const ChannelSet& channels) const override;
+    Subscribed createSubscription(const ChannelSet& channels) override;
+    std::expected<platform::ReportingSample, Error> createSamples(const Subscription& subscription,
+                                                                  const ChannelSet& channels) override;
+    // Values, hits, transitions and residencies subtracted; the duty cycle is the share of the difference.
+    std::expected<platform::ReportingSample, Error> createDifference(const platform::ReportingSample& from,
+                                                                     const platform::ReportingSample& to) override;
+
+private:
+    struct Selection;
+    [[nodiscard]] std::vector<platform::ReportingChannel> select(const ChannelSet& channels) const;
+
+    std::vector<platform::ReportingChannel> channels_;
+    std::map<std::pair<Name, Name>, Failures> failures_;
+    std::optional<Error> differenceError_;
+    std::vector<std::pair<Name, Name>> asked_;
+};
+
+} // namespace support

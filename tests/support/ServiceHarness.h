@@ -1,0 +1,107 @@
+// A whole service on fakes, and clients that speak its protocol to it by number, through the adapter that a real
+// connection uses.
+//
+//     ServiceHarness harness;
+//     auto player = harness.connect("player");
+//     EXPECT_EQ(player.call(CreateReportingSession, 42), answeredOnce(succeeded));
+#pragma once
+
+#include "client/KestoReportingClientServerInstance.h"
+#include "service/KestoReportingServiceDelegate.h"
+#include "support/FakeConnection.h"
+#include "support/TestPlatform.h"
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace support {
+
+// The protocol's operations by their numbers.
+enum Method : std::uint8_t {
+    CreateReportingSession = 1,
+    SetServiceType,
+    GetServiceNameForReporterID,
+    SetConfiguration,
+    StartReportingSessionForID,
+    SendMessage,
+    StopReportingSessionForID,
+    DestroyReportingSession,
+    ValidReporterID,
+    GetAllReporters,
+    KillService
+};
+
+// What came back for one call, in order: each [error, values...].
+using Answers = std::vector<foundation::Array>;
+inline const foundation::Value null;
+inline const foundation::Array succeeded{null, true};
+inline const foundation::Array delivered{null};
+inline Answers answeredOnce(foundation::Array answer)
+{
+    return {std::move(answer)};
+}
+inline const Answers unanswered;
+
+// A client process. Declared after its service, so that it goes first.
+class TestClient {
+public:
+    TestClient(TestPlatform& platform, std::shared_ptr<FakeConnection> connection,
+               std::shared_ptr<KestoReportingClientServerInstance> object)
+        : platform_(platform),
+          connection_(std::move(connection)),
+          object_(object)
+    {
+    }
+
+    // Makes the call, lets the service work until it rests, and tells what was answered.
+    template <typename... Arguments> Answers call(Method method, const Arguments&... arguments)
+    {
+        const std::uint64_t number = submit(method, {foundation::Value(arguments)...});
+        platform_.workQueues.runAll();
+        return answersTo(number);
+    }
+    // Only makes the call; its number.
+    std::uint64_t submit(Method method, const foundation::Array& arguments);
+    [[nodiscard]] Answers answersTo(std::uint64_t number) const;
+
+    // The end of the connection, and what the service does about it.
+    void close();
+    void breakOff();
+
+    [[nodiscard]] FakeConnection& connection() const { return *connection_; }
+    // The client as the service sees it; null once it is gone.
+    [[nodiscard]] std::shared_ptr<KestoReportingClientServerInstance> object() const { return object_.lock(); }
+    // The client's own session of that ID, or null.
+    [[nodiscard]] std::shared_ptr<KestoReportingSession> session(std::int64_t reporterID) const;
+
+private:
+    TestPlatform& platform_;
+    std::shared_ptr<FakeConnection> connection_;
+    std::weak_ptr<KestoReportingClientServerInstance> object_;
+    std::uint64_t lastCall_ = 0;
+};
+
+class ServiceHarness {
+public:
+    // `prepare` sets the device up before the service starts.
+    explicit ServiceHarness(const std::function<void(TestPlatform&)>& prepare = {});
+
+    // A new process connects and is registered. The log and the trace are cleared of it.
+    TestClient connect(std::string processName = "player");
+    // Forgets what was logged and traced so far.
+    void forget();
+
+    TestPlatform platform;
+    FakeConnectionListener listener;
+    std::shared_ptr<KestoReportingServiceDelegate> service;
+
+    static constexpr std::int32_t firstPID = 1001; // of the clients, which count up from here
+
+private:
+    std::int32_t nextPID_ = firstPID;
+};
+
+} // namespace support
