@@ -1,6 +1,7 @@
 #include "foundation/Cbor.h"
 
 #include <algorithm>
+#include <array>
 #include <bit>
 #include <cmath>
 #include <cstring>
@@ -399,7 +400,8 @@ String CborDecoder::internKey(std::string_view key)
     std::size_t hash = key.size();
     for (const char character : key)
         hash = hash * 31 + static_cast<std::uint8_t>(character);
-    String& remembered = keys_[(hash ^ hash >> 8) % keys_.size()];
+    keys_.resize(rememberedKeys);
+    String& remembered = keys_[(hash ^ hash >> 8) % rememberedKeys];
     if (remembered.view() != key)
         remembered = String(key);
     return remembered;

@@ -11,11 +11,11 @@
 
 #include "foundation/Value.h"
 
-#include <array>
 #include <cstddef>
 #include <expected>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace foundation {
 
@@ -66,7 +66,8 @@ private:
     [[nodiscard]] String internKey(std::string_view key);
 
     static constexpr std::size_t longestRememberedKey = 64;
-    std::array<String, 256> keys_; // by a hash of their characters; a newcomer takes the place
+    static constexpr std::size_t rememberedKeys = 256;
+    std::vector<String> keys_; // from the first key on, by a hash of their characters; a newcomer takes the place
 };
 
 } // namespace foundation

@@ -1,3 +1,5 @@
+// What a number is worth: conversions that never leave the range of their result, and equality that is exact,
+// so that no integer is compared by way of a double that cannot hold it.
 #include "foundation/Number.h"
 
 #include <cmath>
@@ -26,7 +28,7 @@ bool equalsInteger(double value, std::uint64_t integer) noexcept
 
 bool Number::booleanValue() const noexcept
 {
-    return isFloat() ? doubleValue() != 0 : unsigned_ != 0;
+    return isFloat() ? doubleValue() != 0 : bits_ != 0;
 }
 
 std::int64_t Number::int64Value() const noexcept
@@ -34,9 +36,9 @@ std::int64_t Number::int64Value() const noexcept
     constexpr auto least = std::numeric_limits<std::int64_t>::min();
     constexpr auto most = std::numeric_limits<std::int64_t>::max();
     if (kind_ == Kind::Unsigned64)
-        return unsigned_ > static_cast<std::uint64_t>(most) ? most : static_cast<std::int64_t>(unsigned_);
+        return std::in_range<std::int64_t>(bits_) ? signedBits() : most;
     if (!isFloat())
-        return signed_;
+        return signedBits();
     const double value = doubleValue();
     if (std::isnan(value))
         return 0;
@@ -48,10 +50,10 @@ std::int64_t Number::int64Value() const noexcept
 double Number::doubleValue() const noexcept
 {
     switch (kind_) {
-    case Kind::Float32: return float32_;
-    case Kind::Float64: return float64_;
-    case Kind::Unsigned64: return static_cast<double>(unsigned_);
-    default: return static_cast<double>(signed_);
+    case Kind::Float32: return std::bit_cast<float>(static_cast<std::uint32_t>(bits_));
+    case Kind::Float64: return std::bit_cast<double>(bits_);
+    case Kind::Unsigned64: return static_cast<double>(bits_);
+    default: return static_cast<double>(signedBits());
     }
 }
 
@@ -66,10 +68,10 @@ void Number::appendText(std::string& out) const
 {
     const auto append = [&out](auto value) { fmt::format_to(std::back_inserter(out), "{}", value); };
     switch (kind_) {
-    case Kind::Unsigned64: return append(unsigned_);
-    case Kind::Float32: return append(float32_);
-    case Kind::Float64: return append(float64_);
-    default: return append(signed_);
+    case Kind::Unsigned64: return append(bits_);
+    case Kind::Float32: return append(static_cast<float>(doubleValue()));
+    case Kind::Float64: return append(doubleValue());
+    default: return append(signedBits());
     }
 }
 
@@ -80,13 +82,11 @@ bool operator==(const Number& left, const Number& right) noexcept
     if (right.isFloat())
         return right == left;
     if (left.isFloat())
-        return right.kind_ == Number::Kind::Unsigned64 ? equalsInteger(left.doubleValue(), right.unsigned_)
-                                                       : equalsInteger(left.doubleValue(), right.signed_);
-    if (left.kind_ == Number::Kind::Unsigned64)
-        return right.kind_ == Number::Kind::Unsigned64 ? left.unsigned_ == right.unsigned_
-                                                       : std::cmp_equal(left.unsigned_, right.signed_);
-    return right.kind_ == Number::Kind::Unsigned64 ? std::cmp_equal(left.signed_, right.unsigned_)
-                                                   : left.signed_ == right.signed_;
+        return right.kind_ == Number::Kind::Unsigned64 ? equalsInteger(left.doubleValue(), right.bits_)
+                                                       : equalsInteger(left.doubleValue(), right.signedBits());
+    // Equal bits mean equal integers, unless the kinds read the highest bit differently.
+    const bool sameSign = (left.kind_ == Number::Kind::Unsigned64) == (right.kind_ == Number::Kind::Unsigned64);
+    return left.bits_ == right.bits_ && (sameSign || left.signedBits() >= 0);
 }
 
 } // namespace foundation

@@ -5,6 +5,7 @@
 // it sent true before has not said anything new.
 #pragma once
 
+#include <bit>
 #include <concepts>
 #include <cstdint>
 #include <optional>
@@ -19,16 +20,13 @@ public:
     enum class Kind : std::uint8_t { Boolean, Signed64, Unsigned64, Float32, Float64 };
 
     constexpr Number() noexcept : Number(std::int64_t{0}) { }
-    constexpr explicit Number(std::same_as<bool> auto value) noexcept : kind_(Kind::Boolean), signed_(value) { }
-    constexpr explicit Number(std::signed_integral auto value) noexcept : kind_(Kind::Signed64), signed_(value) { }
+    constexpr explicit Number(std::signed_integral auto value) noexcept : Number(Kind::Signed64, bitsOf(value)) { }
     constexpr explicit Number(std::unsigned_integral auto value) noexcept
-        requires(!std::same_as<decltype(value), bool>)
-        : kind_(Kind::Unsigned64),
-          unsigned_(value)
+        : Number(std::same_as<decltype(value), bool> ? Kind::Boolean : Kind::Unsigned64, value)
     {
     }
-    constexpr explicit Number(float value) noexcept : kind_(Kind::Float32), float32_(value) { }
-    constexpr explicit Number(double value) noexcept : kind_(Kind::Float64), float64_(value) { }
+    constexpr explicit Number(float value) noexcept : Number(Kind::Float32, std::bit_cast<std::uint32_t>(value)) { }
+    constexpr explicit Number(double value) noexcept : Number(Kind::Float64, std::bit_cast<std::uint64_t>(value)) { }
 
     [[nodiscard]] constexpr Kind kind() const noexcept { return kind_; }
     [[nodiscard]] constexpr bool isFloat() const noexcept { return kind_ >= Kind::Float32; }
@@ -39,7 +37,7 @@ public:
     [[nodiscard]] std::int64_t int64Value() const noexcept;
     [[nodiscard]] double doubleValue() const noexcept;
 
-    // The value as an integer of that type, when it is a whole number in its range and not a boolean.
+    // The value as an integer of that type, when the number is of an integer kind and in range.
     template <std::integral Integer> [[nodiscard]] std::optional<Integer> exactly() const noexcept;
 
     // Integers in decimal, booleans 1 and 0, floats the shortest decimal that reads back to the same
@@ -54,13 +52,12 @@ public:
 private:
     friend class Value;
 
+    constexpr Number(Kind kind, std::uint64_t bits) noexcept : kind_(kind), bits_(bits) { }
+    static constexpr std::uint64_t bitsOf(std::int64_t value) noexcept { return static_cast<std::uint64_t>(value); }
+    [[nodiscard]] constexpr std::int64_t signedBits() const noexcept { return static_cast<std::int64_t>(bits_); }
+
     Kind kind_;
-    union {
-        std::int64_t signed_; // booleans too
-        std::uint64_t unsigned_;
-        float float32_;
-        double float64_;
-    };
+    std::uint64_t bits_; // of the integer in two's complement, or of the float of either width
 };
 
 template <std::integral Integer> std::optional<Integer> Number::exactly() const noexcept
@@ -71,8 +68,8 @@ template <std::integral Integer> std::optional<Integer> Number::exactly() const 
         return static_cast<Integer>(value);
     };
     switch (kind_) {
-    case Kind::Signed64: return inRange(signed_);
-    case Kind::Unsigned64: return inRange(unsigned_);
+    case Kind::Signed64: return inRange(signedBits());
+    case Kind::Unsigned64: return inRange(bits_);
     default: return std::nullopt;
     }
 }

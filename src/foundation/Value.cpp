@@ -3,7 +3,6 @@
 #include "foundation/Json.h"
 
 #include <algorithm>
-#include <bit>
 #include <charconv>
 #include <cmath>
 #include <numeric>
@@ -71,16 +70,6 @@ Value::~Value()
     case Kind::Dictionary: DictionaryObject::destroy(objectAs<DictionaryObject>()); break;
     default: StringObject::destroy(objectAs<StringObject>()); break;
     }
-}
-
-Number Value::numberUnchecked() const noexcept
-{
-    Number number;
-    number.kind_ = numberKind_;
-    number.unsigned_ = scalar_;
-    if (numberKind_ == Number::Kind::Float32)
-        number.float32_ = std::bit_cast<float>(static_cast<std::uint32_t>(scalar_));
-    return number;
 }
 
 std::optional<Number> Value::number() const noexcept

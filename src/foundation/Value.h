@@ -41,11 +41,7 @@ public:
     enum class Kind : std::uint8_t { Null, Number, String, Array, Dictionary, Data, Date };
 
     constexpr Value() noexcept = default;
-    constexpr Value(Number number) noexcept : kind_(Kind::Number), numberKind_(number.kind_), scalar_(number.unsigned_)
-    {
-        if (number.kind_ == Number::Kind::Float32)
-            scalar_ &= 0xFFFFFFFF;
-    }
+    constexpr Value(Number number) noexcept : kind_(Kind::Number), numberKind_(number.kind_), scalar_(number.bits_) { }
     constexpr Value(std::integral auto number) noexcept : Value(Number(number)) { }
     constexpr Value(std::floating_point auto number) noexcept : Value(Number(number)) { }
     Value(String text) noexcept;
@@ -90,7 +86,7 @@ public:
 
 private:
     [[nodiscard]] bool isShared() const noexcept;
-    [[nodiscard]] Number numberUnchecked() const noexcept;
+    [[nodiscard]] Number numberUnchecked() const noexcept { return {numberKind_, scalar_}; }
     [[nodiscard]] std::string_view bytesUnchecked() const noexcept;
     template <typename Object> [[nodiscard]] const Object* objectAs() const noexcept;
     template <typename Object> [[nodiscard]] Reference<Object> shareAs() const noexcept;
