@@ -1,6 +1,6 @@
-// A record is the kind's number (4 bytes), the length of the payload (4 bytes), and the payload as CBOR.
 #include "session/KestoReportingMessageStore.h"
 
+#include "foundation/Cbor.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <algorithm>
@@ -9,11 +9,6 @@
 
 namespace {
 
-struct RecordHead {
-    std::uint32_t kind;
-    std::uint32_t length;
-};
-
 // Small sessions stay small, large ones get by with few allocations.
 constexpr std::size_t firstChunk = 512;
 constexpr std::size_t largestChunk = std::size_t{256} << 10;
@@ -21,29 +16,42 @@ constexpr std::size_t largestChunk = std::size_t{256} << 10;
 // A larger payload accepted last is decoded again when it is compared: it would take many times its bytes.
 constexpr std::size_t largestKeptDecoded = 1024;
 
+// Larger payloads are kept as they are: none comes from a client in one frame, only the summary of a session
+// grows like that, and it need not be in memory twice.
+constexpr std::size_t largestEncoded = std::size_t{1} << 20;
+
 // Stamps that a client may add to any message; they say when, not what.
 constexpr std::array<std::string_view, 3> timeStampKeys{"processuptime_ms", "systemuptime_sec",
                                                         KestoReportingTimestampKey};
 
-// A payload that was encoded here; it may nest as deep as preferences do.
-foundation::Dictionary decoded(std::string_view encoded)
+// The characters of the payload's keys and strings, which is what makes a payload large.
+std::size_t textSize(const foundation::Dictionary& payload)
 {
-    constexpr unsigned anyDepth = 1000;
-    foundation::CborDecoder decoder;
-    const auto value = decoder.decode(encoded, anyDepth);
-    return value ? value->dictionary().value_or(foundation::Dictionary()) : foundation::Dictionary();
+    std::size_t size = 0;
+    for (const auto& [key, value] : payload)
+        size += key.view().size() + value.stringView().size();
+    return size;
 }
 
 } // namespace
 
-KestoReportingMessageStore::KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget)
-    : budget_(std::move(budget))
+foundation::Dictionary KestoReportingMessageStore::Payload::dictionary() const
+{
+    if (kept_ != nullptr)
+        return *kept_;
+    return foundation::CborItem(encoded_).value().dictionary().value_or(foundation::Dictionary());
+}
+
+KestoReportingMessageStore::KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget,
+                                                       std::span<const std::string_view> markedKeys)
+    : budget_(std::move(budget)),
+      markedKeys_(markedKeys.begin(), markedKeys.end())
 {
 }
 
 KestoReportingMessageStore::~KestoReportingMessageStore()
 {
-    budget_->giveBack(bytesTaken_);
+    budget_->giveBack(paid_);
 }
 
 KestoReportingMessageStore::Outcome KestoReportingMessageStore::record(AudioEventCategory category, AudioEventType type,
@@ -54,20 +62,13 @@ KestoReportingMessageStore::Outcome KestoReportingMessageStore::record(AudioEven
     const bool isError = category == AudioEventCategoryError || type == AudioEventTypeError;
     if (!isError && repeatsLast(kind, payload))
         return Outcome::Redundant;
-
-    scratch_.clear();
-    foundation::appendCbor(payload, scratch_);
-    const RecordHead head{number, static_cast<std::uint32_t>(scratch_.size())};
-    char* place = allocate(sizeof head + scratch_.size());
-    if (place == nullptr)
+    const bool isMarked = std::ranges::any_of(markedKeys_, [&](std::string_view key) { return payload.contains(key); });
+    if (!append({number, isMarked, 0}, payload, kind.last))
         return Outcome::Full;
-    std::memcpy(place, &head, sizeof head);
-    std::memcpy(place + sizeof head, scratch_.data(), scratch_.size());
     ++size_;
     ++kind.count;
-    kind.lastEncoded = {place + sizeof head, scratch_.size()};
-    kind.hasLastPayload = scratch_.size() <= largestKeptDecoded;
-    kind.lastPayload = kind.hasLastPayload ? payload : foundation::Dictionary();
+    kind.isLastDecoded = kind.last.encoded_.size() <= largestKeptDecoded;
+    kind.lastDecoded = kind.isLastDecoded ? payload : foundation::Dictionary();
     return Outcome::Recorded;
 }
 
@@ -75,8 +76,7 @@ bool KestoReportingMessageStore::repeatsLast(const Kind& kind, const foundation:
 {
     if (kind.count == 0)
         return false;
-    const foundation::Dictionary last = kind.hasLastPayload ? kind.lastPayload : decoded(kind.lastEncoded);
-    return payload.isEqualIgnoring(last, timeStampKeys);
+    return payload.isEqualIgnoring(kind.isLastDecoded ? kind.lastDecoded : kind.last.dictionary(), timeStampKeys);
 }
 
 std::uint32_t KestoReportingMessageStore::kindOf(AudioEventCategory category, AudioEventType type)
@@ -87,8 +87,38 @@ std::uint32_t KestoReportingMessageStore::kindOf(AudioEventCategory category, Au
     key += KestoReportingUtilityTypeString(type);
     const auto [found, isNew] = kindByKey_.try_emplace(std::move(key), static_cast<std::uint32_t>(kinds_.size()));
     if (isNew)
-        kinds_.push_back({.key = found->first, .count = 0, .lastEncoded = {}, .lastPayload = {}});
+        kinds_.emplace_back().key = found->first;
     return found->second;
+}
+
+bool KestoReportingMessageStore::append(Head head, const foundation::Dictionary& payload, Payload& appended)
+{
+    scratch_.clear();
+    if (const std::size_t size = textSize(payload); size > largestEncoded) {
+        if (!pay(size))
+            return false;
+        head.size = keptAside;
+    } else {
+        foundation::appendCbor(payload, scratch_);
+        head.size = static_cast<std::uint32_t>(scratch_.size());
+    }
+    char* place = allocate(sizeof head + scratch_.size());
+    if (place == nullptr)
+        return false;
+    std::memcpy(place, &head, sizeof head);
+    std::memcpy(place + sizeof head, scratch_.data(), scratch_.size());
+    appended.encoded_ = {place + sizeof head, scratch_.size()};
+    appended.kept_ = head.size == keptAside ? &large_.emplace_back(payload) : nullptr;
+    return true;
+}
+
+// Takes so many bytes from the budget.
+bool KestoReportingMessageStore::pay(std::size_t bytes)
+{
+    if (!budget_->take(bytes))
+        return false;
+    paid_ += bytes;
+    return true;
 }
 
 // Room for so many bytes, or null pointer when the budget has no more.
@@ -97,9 +127,8 @@ char* KestoReportingMessageStore::allocate(std::size_t bytes)
     if (chunks_.empty() || chunks_.back().capacity - chunks_.back().used < bytes) {
         const std::size_t next = chunks_.empty() ? firstChunk : std::min(chunks_.back().capacity * 2, largestChunk);
         const std::size_t capacity = std::max(next, bytes);
-        if (!budget_->take(capacity))
+        if (!pay(capacity))
             return nullptr;
-        bytesTaken_ += capacity;
         chunks_.push_back({std::make_unique_for_overwrite<char[]>(capacity), 0, capacity});
     }
     Chunk& chunk = chunks_.back();
@@ -108,19 +137,16 @@ char* KestoReportingMessageStore::allocate(std::size_t bytes)
     return place;
 }
 
-void KestoReportingMessageStore::forEach(
-    const std::function<void(const std::string& identifier, const foundation::Dictionary& payload)>& visit) const
+KestoReportingMessageStore::Head KestoReportingMessageStore::headAt(const char* place)
 {
-    std::vector<std::uint64_t> seen(kinds_.size());
-    for (const Chunk& chunk : chunks_) {
-        for (std::string_view rest(chunk.bytes.get(), chunk.used); !rest.empty();) {
-            RecordHead head;
-            std::memcpy(&head, rest.data(), sizeof head);
-            const std::string identifier = kinds_[head.kind].key + '_' + std::to_string(++seen[head.kind]);
-            visit(identifier, decoded(rest.substr(sizeof head, head.length)));
-            rest.remove_prefix(sizeof head + head.length);
-        }
-    }
+    Head head;
+    std::memcpy(&head, place, sizeof head);
+    return head;
+}
+
+std::string KestoReportingMessageStore::identifier(const Message& message) const
+{
+    return kinds_[message.kind].key + '_' + std::to_string(message.index);
 }
 
 foundation::Dictionary KestoReportingMessageStore::counts() const

@@ -1,21 +1,22 @@
 // The messages of one run of a session, in the order of acceptance, each under an identifier made of its kind
 // and a running number ("Volume_Summary_3").
 //
-// A session may record millions of messages, so they are kept encoded, one behind the other in large
-// chunks, and identifiers are not kept at all: the kind's number is, and the index follows from the
-// order. What decides on the next message is kept ready: per kind, the count and the payload accepted last.
+// A session may record millions of messages, so they are kept encoded, one behind the other in large chunks, and
+// identifiers are not kept at all: the kind's number is, and the index follows from the order. What
+// decides on the next message is kept ready: per kind, the count and the payload accepted last.
 #pragma once
 
-#include "foundation/Cbor.h"
+#include "foundation/CborView.h"
 #include "foundation/Value.h"
 #include "session/KestoReportingStorageBudget.h"
 #include "utility/KestoReportingVocabulary.h"
 
 #include <cstdint>
-#include <functional>
+#include <deque>
 #include <memory>
 #include <span>
 #include <string>
+#include <string_view>
 #include <unordered_map>
 #include <vector>
 
@@ -28,7 +29,37 @@ public:
         Full // the budget is used up; the message is lost
     };
 
-    explicit KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget);
+    // A payload as it is kept. Valid as long as the store records nothing.
+    class Payload {
+    public:
+        [[nodiscard]] foundation::Dictionary dictionary() const;
+
+        // Calls `visit` with the key and the value of each entry. The value is a `foundation::CborItem` or a
+        // `foundation::Value`; both have `value` or are one, and `appendText`.
+        template <typename Visit> void forEach(Visit visit) const
+        {
+            if (kept_ == nullptr)
+                return foundation::forEachCborEntry(encoded_, visit);
+            for (const auto& [key, value] : *kept_)
+                visit(key.view(), value);
+        }
+
+    private:
+        friend class KestoReportingMessageStore;
+        std::string_view encoded_;
+        const foundation::Dictionary* kept_ = nullptr; // in place of the encoding, where it is large
+    };
+
+    struct Message {
+        std::uint32_t kind; // its number in `kindKey`
+        std::uint64_t index; // from 1 among the messages of its kind
+        bool isMarked; // carries one of the marked keys
+        Payload payload;
+    };
+
+    // Messages with any of the marked keys are marked, so that they are found again without looking into all.
+    explicit KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget,
+                                        std::span<const std::string_view> markedKeys = {});
     ~KestoReportingMessageStore();
     KestoReportingMessageStore(const KestoReportingMessageStore&) = delete;
     KestoReportingMessageStore& operator=(const KestoReportingMessageStore&) = delete;
@@ -39,39 +70,72 @@ public:
 
     [[nodiscard]] std::size_t size() const noexcept { return size_; }
     [[nodiscard]] bool empty() const noexcept { return size_ == 0; }
-    // The bytes that the recorded messages take.
-    [[nodiscard]] std::size_t bytes() const noexcept { return bytesTaken_; }
 
-    // Calls `visit` for each message in the order of acceptance.
-    void forEach(
-        const std::function<void(const std::string& identifier, const foundation::Dictionary& payload)>& visit) const;
+    // Calls `visit` with each `Message`, in the order of acceptance.
+    template <typename Visit> void forEach(Visit visit) const;
 
-    // By kind ("Volume_Summary"), the number of the message accepted last.
+    // "Volume_Summary"
+    [[nodiscard]] std::string_view kindKey(std::uint32_t kind) const { return kinds_[kind].key; }
+    // "Volume_Summary_3"
+    [[nodiscard]] std::string identifier(const Message& message) const;
+    // By kind, the number of the message accepted last.
     [[nodiscard]] foundation::Dictionary counts() const;
 
 private:
     struct Kind {
         std::string key;
         std::uint64_t count = 0;
-        std::string_view lastEncoded; // in a chunk
-        foundation::Dictionary lastPayload; // where it is small: decoded
-        bool hasLastPayload = false;
+        Payload last;
+        foundation::Dictionary lastDecoded; // while `isLastDecoded`
+        bool isLastDecoded = false;
     };
     struct Chunk {
         std::unique_ptr<char[]> bytes;
         std::size_t used = 0;
         std::size_t capacity = 0;
     };
+    // What stands before each payload in a chunk.
+    struct Head {
+        std::uint32_t kind : 31;
+        std::uint32_t isMarked : 1;
+        std::uint32_t size; // of the encoding; `keptAside` for a payload in `large_`
+    };
+    static constexpr std::uint32_t keptAside = 0xFFFFFFFF;
 
     std::uint32_t kindOf(AudioEventCategory category, AudioEventType type);
     [[nodiscard]] static bool repeatsLast(const Kind& kind, const foundation::Dictionary& payload);
+    [[nodiscard]] bool append(Head head, const foundation::Dictionary& payload, Payload& appended);
+    [[nodiscard]] bool pay(std::size_t bytes);
     [[nodiscard]] char* allocate(std::size_t bytes);
+    static Head headAt(const char* place);
 
-    std::shared_ptr<KestoReportingStorageBudget> budget_;
+    const std::shared_ptr<KestoReportingStorageBudget> budget_;
+    const std::vector<std::string_view> markedKeys_;
     std::vector<Chunk> chunks_;
+    std::deque<foundation::Dictionary> large_;
     std::vector<Kind> kinds_;
     std::unordered_map<std::string, std::uint32_t> kindByKey_;
     std::size_t size_ = 0;
-    std::size_t bytesTaken_ = 0;
+    std::size_t paid_ = 0;
     std::string scratch_;
 };
+
+template <typename Visit> void KestoReportingMessageStore::forEach(Visit visit) const
+{
+    std::vector<std::uint64_t> seen(kinds_.size());
+    auto large = large_.begin();
+    for (const Chunk& chunk : chunks_) {
+        for (std::size_t at = 0; at != chunk.used;) {
+            const Head head = headAt(chunk.bytes.get() + at);
+            at += sizeof head;
+            Message message{head.kind, ++seen[head.kind], head.isMarked != 0, {}};
+            if (head.size == keptAside) {
+                message.payload.kept_ = &*large++;
+            } else {
+                message.payload.encoded_ = {chunk.bytes.get() + at, head.size};
+                at += head.size;
+            }
+            visit(static_cast<const Message&>(message));
+        }
+    }
+}

@@ -12,6 +12,7 @@
 #include "sinks/KestoReportingSinkSession.h"
 #include "utility/KestoReportingError.h"
 
+#include <array>
 #include <atomic>
 #include <cstdint>
 #include <memory>
@@ -71,6 +72,20 @@ public:
     static void sendSingleMessage(const foundation::Dictionary& message, AudioEventCategory category,
                                   AudioEventType type, AudioServiceType serviceType,
                                   const foundation::Dictionary& userInfo, const KestoReportingReply& reply);
+
+    // The payloads of the messages in order, those that carry any of the keys folded together: one that comes no
+    // more than the pause (seconds) after the one before joins it, at the place of the first of them.
+    [[nodiscard]] static std::vector<foundation::Dictionary>
+    combineRapidMessages(const KestoReportingMessageStore& messages, std::span<const std::string_view> keysToCombine,
+                         double maximumPausetime);
+    // The keys of the switches that arrive in bursts; what the volume analysis folds. Sessions mark their messages.
+    static constexpr std::array<std::string_view, 2> rapidMessageKeys{"spatial-audio-accessory-feature",
+                                                                      "spatializationEnabled"};
+    // One event for each stretch of more than so many seconds during which output ran unchanged. The messages are
+    // marked by `rapidMessageKeys`. Without a process there are none.
+    [[nodiscard]] static std::vector<foundation::Dictionary>
+    createVolumeMessages(const KestoReportingMessageStore& messages, const std::optional<foundation::Value>& process,
+                         double minimumPlaytime);
 
     // The reply of the call that started this run, kept by the client instance until its work is done.
     [[nodiscard]] const KestoReportingResultReply<bool>& transactionCompleteBlock() const

@@ -67,9 +67,10 @@ std::optional<std::vector<foundation::Dictionary>> KestoReportingSession::nested
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
     if (!nestedAggregatedPayloadData_)
         return std::nullopt;
+    const KestoReportingMessageStore& store = *nestedAggregatedPayloadData_;
     std::vector<foundation::Dictionary> messages;
-    nestedAggregatedPayloadData_->forEach([&](const std::string& identifier, const foundation::Dictionary& payload) {
-        messages.push_back({{foundation::String(identifier), payload}});
+    store.forEach([&](const KestoReportingMessageStore::Message& message) {
+        messages.push_back({{foundation::String(store.identifier(message)), message.payload.dictionary()}});
     });
     return messages;
 }

@@ -1,0 +1,78 @@
+#include "session/KestoReportingVolumeFields.h"
+
+#include "foundation/Cbor.h"
+#include "utility/KestoReportingUtility.h"
+
+namespace {
+
+using Key = KestoReportingVolumeKey;
+
+constexpr std::array<std::string_view, static_cast<std::size_t>(Key::Count)> names{KestoReportingTimestampKey,
+                                                                                   "session_output_running",
+                                                                                   "session_duration",
+                                                                                   "session_selected_format",
+                                                                                   "active_devices",
+                                                                                   "spatializationEnabled",
+                                                                                   "spatial-audio-accessory-feature",
+                                                                                   "ringerstate",
+                                                                                   "PomoSessionVolume",
+                                                                                   "mChannelsPerFrame"};
+
+// By length first: nearly every key of a message is told apart by it.
+std::optional<Key> keyOf(std::string_view name)
+{
+    const auto candidates = [&]() -> std::array<Key, 2> {
+        switch (name.size()) {
+        case 11: return {Key::RingerState, Key::RingerState};
+        case 14: return {Key::ActiveDevices, Key::ActiveDevices};
+        case 16: return {Key::Duration, Key::Duration};
+        case 17: return {Key::Volume, Key::ChannelsPerFrame};
+        case 21: return {Key::SpatializationEnabled, Key::SpatializationEnabled};
+        case 22: return {Key::OutputRunning, Key::OutputRunning};
+        case 23: return {Key::SelectedFormat, Key::SelectedFormat};
+        case 24: return {Key::Timestamp, Key::Timestamp};
+        case 31: return {Key::SpatialAudioAccessoryFeature, Key::SpatialAudioAccessoryFeature};
+        default: return {Key::Count, Key::Count};
+        }
+    }();
+    for (const Key key : candidates)
+        if (key != Key::Count && KestoReportingVolumeKeyName(key) == name)
+            return key;
+    return std::nullopt;
+}
+
+} // namespace
+
+std::string_view KestoReportingVolumeKeyName(KestoReportingVolumeKey key)
+{
+    return names[static_cast<std::size_t>(key)];
+}
+
+void KestoReportingVolumeFields::merge(const KestoReportingVolumeFields& other)
+{
+    for (std::size_t index = 0; index < items_.size(); ++index)
+        if (!other.items_[index].bytes().empty())
+            items_[index] = other.items_[index];
+}
+
+KestoReportingVolumeFields KestoReportingVolumeFieldsReader::read(const KestoReportingMessageStore::Payload& payload)
+{
+    KestoReportingVolumeFields fields;
+    payload.forEach([&](std::string_view name, const auto& value) {
+        const auto key = keyOf(name);
+        if (!key)
+            return;
+        if constexpr (requires { value.bytes(); })
+            fields.set(*key, value);
+        else
+            fields.set(*key, keep(value));
+    });
+    return fields;
+}
+
+foundation::CborItem KestoReportingVolumeFieldsReader::keep(const foundation::Value& value)
+{
+    std::string& encoded = kept_.emplace_back();
+    foundation::appendCbor(value, encoded);
+    return foundation::CborItem(encoded);
+}

@@ -1,0 +1,66 @@
+// The entries of a message that the volume analysis looks at, and nothing else of it.
+//
+// They are left encoded, in the store's own memory: a session's end looks at every message, and unpacking them
+// would cost more than the analysis.
+#pragma once
+
+#include "foundation/CborView.h"
+#include "session/KestoReportingMessageStore.h"
+
+#include <array>
+#include <cstdint>
+#include <deque>
+#include <optional>
+#include <string>
+#include <string_view>
+
+enum class KestoReportingVolumeKey : std::uint8_t {
+    Timestamp,
+    OutputRunning,
+    Duration,
+    SelectedFormat,
+    ActiveDevices,
+    SpatializationEnabled,
+    SpatialAudioAccessoryFeature,
+    RingerState,
+    Volume,
+    ChannelsPerFrame,
+    Count
+};
+
+[[nodiscard]] std::string_view KestoReportingVolumeKeyName(KestoReportingVolumeKey key);
+
+// One thread at a time.
+class KestoReportingVolumeFields {
+public:
+    using Key = KestoReportingVolumeKey;
+
+    [[nodiscard]] bool has(Key key) const { return !item(key).bytes().empty(); }
+    // The entry's value; null when there is none.
+    [[nodiscard]] foundation::Value value(Key key) const { return has(key) ? item(key).value() : foundation::Value(); }
+    // Whether both are the same bytes, and so surely equal text.
+    [[nodiscard]] bool isSameEncoding(const KestoReportingVolumeFields& other, Key key) const
+    {
+        return item(key).bytes() == other.item(key).bytes();
+    }
+
+    void set(Key key, foundation::CborItem item) { items_[static_cast<std::size_t>(key)] = item; }
+    // Takes over all entries that the other has.
+    void merge(const KestoReportingVolumeFields& other);
+
+private:
+    [[nodiscard]] foundation::CborItem item(Key key) const { return items_[static_cast<std::size_t>(key)]; }
+
+    std::array<foundation::CborItem, static_cast<std::size_t>(Key::Count)> items_;
+};
+
+// Reads the fields of payloads; they are valid as long as the reader and the store.
+class KestoReportingVolumeFieldsReader {
+public:
+    [[nodiscard]] KestoReportingVolumeFields read(const KestoReportingMessageStore::Payload& payload);
+    // The value, encoded and kept here.
+    [[nodiscard]] foundation::CborItem keep(const foundation::Value& value);
+
+private:
+    std::deque<std::string> kept_;
+};
