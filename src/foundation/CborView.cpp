@@ -2,11 +2,12 @@
 
 #include "foundation/Cbor.h"
 
-#include <array>
-#include <cstdint>
-
 namespace foundation {
 namespace {
+
+// The first byte's upper three bits, and what stands for a value of its own there.
+enum Major { Bytes = 2, Text = 3, List = 4, Map = 5, Tag = 6, Simple = 7 };
+constexpr std::uint64_t null = 22;
 
 struct Head {
     int major;
@@ -34,11 +35,11 @@ std::size_t itemSize(std::string_view bytes) noexcept
         const Head head = headOf(bytes.substr(size));
         size += head.size;
         switch (head.major) {
-        case 2:
-        case 3: size += head.argument; break; // bytes, text
-        case 4: pending += head.argument; break; // array
-        case 5: pending += 2 * head.argument; break; // map
-        case 6: ++pending; break; // a tag and its item
+        case Bytes:
+        case Text: size += head.argument; break;
+        case List: pending += head.argument; break;
+        case Map: pending += 2 * head.argument; break;
+        case Tag: ++pending; break;
         default: break;
         }
     }
@@ -47,13 +48,23 @@ std::size_t itemSize(std::string_view bytes) noexcept
 
 } // namespace
 
-void CborItem::appendText(std::string& out) const
+Value::Kind CborItem::kind() const noexcept
 {
     const Head head = headOf(bytes_);
-    if (head.major == 3)
-        out += bytes_.substr(head.size);
-    else
-        value().appendText(out);
+    switch (head.major) {
+    case Bytes: return Value::Kind::Data;
+    case Text: return Value::Kind::String;
+    case List: return Value::Kind::Array;
+    case Map: return Value::Kind::Dictionary;
+    case Tag: return Value::Kind::Date;
+    case Simple: return head.size == 1 && head.argument == null ? Value::Kind::Null : Value::Kind::Number;
+    default: return Value::Kind::Number;
+    }
+}
+
+std::string_view CborItem::string() const noexcept
+{
+    return bytes_.substr(headOf(bytes_).size);
 }
 
 Value CborItem::value() const
@@ -63,19 +74,20 @@ Value CborItem::value() const
     return decoder.decode(bytes_, anyDepth).value_or(Value());
 }
 
-CborMap::CborMap(std::string_view encoded) : entries_(encoded.substr(headOf(encoded).size)) { }
-
-void CborMap::Iterator::readEntry()
+void CborItem::appendText(std::string& out) const
 {
-    if (rest_.empty()) {
-        atEnd_ = true;
-        return;
-    }
-    const Head key = headOf(rest_);
-    entry_.key = rest_.substr(key.size, key.argument);
-    rest_.remove_prefix(key.size + key.argument);
-    entry_.value = CborItem(rest_.substr(0, itemSize(rest_)));
-    rest_.remove_prefix(entry_.value.bytes().size());
+    if (kind() == Value::Kind::String)
+        out += string();
+    else
+        value().appendText(out);
+}
+
+CborItems::CborItems(std::string_view container) : items_(container.substr(headOf(container).size)) { }
+
+void CborItems::Iterator::readItem()
+{
+    item_ = CborItem(rest_.empty() ? rest_ : rest_.substr(0, itemSize(rest_)));
+    rest_.remove_prefix(item_.bytes().size());
 }
 
 } // namespace foundation

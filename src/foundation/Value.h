@@ -69,6 +69,12 @@ public:
     [[nodiscard]] std::optional<Data> data() const noexcept;
     [[nodiscard]] std::optional<Date> date() const noexcept;
 
+    // The characters of a string, without sharing it; nothing of other kinds.
+    [[nodiscard]] std::string_view stringView() const noexcept
+    {
+        return kind_ == Kind::String ? bytesUnchecked() : std::string_view();
+    }
+
     // What the value counts as where a number is asked for: text is read as its leading number, anything
     // that is neither number nor text as 0.
     [[nodiscard]] double asDouble() const noexcept;
