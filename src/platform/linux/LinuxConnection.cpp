@@ -36,7 +36,8 @@ constexpr bool areTooManyUnanswered(std::uint64_t unanswered) noexcept
 class LinuxConnection::Credit {
 public:
     Credit(std::shared_ptr<LinuxConnection> connection, std::size_t bytes) noexcept
-        : connection_(std::move(connection)), bytes_(bytes)
+        : connection_(std::move(connection)),
+          bytes_(bytes)
     {
     }
     ~Credit() { connection_->returnCredit(bytes_); }
@@ -49,7 +50,9 @@ private:
 };
 
 LinuxConnection::LinuxConnection(std::shared_ptr<ConnectionHub> hub, FileDescriptor socket, Peer peer)
-    : hub_(std::move(hub)), peer_(peer), socket_(std::move(socket))
+    : hub_(std::move(hub)),
+      peer_(peer),
+      socket_(std::move(socket))
 {
 }
 
@@ -71,30 +74,39 @@ void LinuxConnection::resume()
 
 bool LinuxConnection::handle(std::uint32_t events)
 {
+    constexpr std::uint32_t endings = EPOLLHUP | EPOLLRDHUP | EPOLLERR;
     if ((events & EPOLLOUT) != 0) {
         const foundation::Lock lock(lock_);
         writeOutput();
     }
-    if (!endIfBroken() && (events & ~EPOLLOUT) != 0) {
+    if ((events & ~EPOLLOUT) != 0 && ((events & endings) == 0 || !isBrokenOff()))
         read();
-        (void)endIfBroken();
-    }
-    const foundation::Lock lock(lock_);
-    return !isOver_;
+    return settle();
 }
 
-// Whether it is over.
-bool LinuxConnection::endIfBroken()
+bool LinuxConnection::isBrokenOff()
+{
+    const foundation::Lock lock(lock_);
+    return breakReason_.has_value();
+}
+
+// After all that may have happened: ends the connection if it broke, else waits for what comes next. Whether it
+// goes on.
+bool LinuxConnection::settle()
 {
     std::optional<std::string> reason;
     {
         const foundation::Lock lock(lock_);
-        if (isOver_ || !breakReason_)
-            return isOver_;
+        if (isOver_)
+            return false;
+        if (!breakReason_) {
+            watch();
+            return true;
+        }
         reason = breakReason_;
     }
     end(std::move(reason));
-    return true;
+    return false;
 }
 
 // One read, so that every client gets its turn. It happens also when the client is behind but gone: what it
@@ -137,8 +149,6 @@ void LinuxConnection::takeIn(std::string_view bytes)
         breakOff(delivered.error().reason);
     else if (!decoded)
         breakOff(decoded.error().reason);
-    const foundation::Lock lock(lock_);
-    watch();
 }
 
 std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()

@@ -64,7 +64,8 @@ public:
 private:
     class Credit;
 
-    [[nodiscard]] bool endIfBroken();
+    [[nodiscard]] bool isBrokenOff();
+    [[nodiscard]] bool settle();
     void read();
     void endOfStream();
     void takeIn(std::string_view bytes);

@@ -1,5 +1,7 @@
 #include "platform/linux/LinuxConnectionListener.h"
 
+#include "platform/linux/SerialQueue.h"
+
 #include <algorithm>
 #include <array>
 #include <cassert>
@@ -51,10 +53,10 @@ LinuxConnectionListener::create(ListeningSocket socket, LogCategory& log)
 
 LinuxConnectionListener::LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake,
                                                  LogCategory& log)
-    : socket_(std::move(socket))
-    , wake_(std::move(wake))
-    , hub_(std::make_shared<ConnectionHub>(std::move(epoll), log))
-    , mostConnections_(mostConnections())
+    : socket_(std::move(socket)),
+      wake_(std::move(wake)),
+      hub_(std::make_shared<ConnectionHub>(std::move(epoll), log)),
+      mostConnections_(mostConnections())
 {
 }
 
@@ -72,6 +74,15 @@ void LinuxConnectionListener::resume()
     resumeAccepting();
     if (listeningHandler_)
         listeningHandler_();
+    serve();
+    for (const auto& [identity, connection] : std::exchange(connections_, {}))
+        connection->invalidate();
+}
+
+// What little the clients ask for is done by this thread once it has read all that is there.
+void LinuxConnectionListener::serve()
+{
+    SerialQueue::Helper helper;
     while (!isStopping_) {
         std::array<epoll_event, mostEventsAtOnce> events;
         const int count = ::epoll_wait(hub_->epoll.get(), events.data(), events.size(), waitingTime());
@@ -79,9 +90,8 @@ void LinuxConnectionListener::resume()
             handle(events[static_cast<std::size_t>(index)]);
         if (acceptAgainAt_ && *acceptAgainAt_ <= Clock::now())
             resumeAccepting();
+        helper.help();
     }
-    for (const auto& [identity, connection] : std::exchange(connections_, {}))
-        connection->invalidate();
 }
 
 void LinuxConnectionListener::stop()
@@ -139,8 +149,8 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     socklen_t size = sizeof peer;
     if (::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0)
         return; // gone already
-    const auto connection
-        = std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid});
+    const auto connection =
+        std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid});
     connections_.emplace(connection.get(), connection);
     ++hub_->counters.accepted;
     if (!delegate_->shouldAcceptNewConnection(*this, connection))

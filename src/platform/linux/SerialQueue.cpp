@@ -3,35 +3,38 @@
 #include "foundation/Mutex.h"
 #include "platform/linux/Thread.h"
 
+#include <cassert>
 #include <utility>
 #include <vector>
 
 namespace platform {
-namespace {
 
-constexpr std::size_t mostRoomKept = 1024; // in items; what a burst needed beyond that is given back
-
-thread_local bool turnIsRunning = false;
-
-} // namespace
-
-class SerialQueue::Work {
+class SerialQueue::Work : public std::enable_shared_from_this<Work> {
 public:
-    explicit Work(std::function<void()> turnEndHandler) : turnEndHandler_(std::move(turnEndHandler)) { }
+    Work(std::function<void()> turnEndHandler, bool isInteractive)
+        : turnEndHandler_(std::move(turnEndHandler)),
+          isInteractive_(isInteractive)
+    {
+    }
 
     void add(WorkItem item)
     {
+        const bool mayHelp = isInteractive_ && thisThread.mayHelp(this);
         bool wake = false;
         {
             const foundation::Lock lock(lock_);
             waiting_.push_back(std::move(item));
-            wake = std::exchange(isAsleep_, false);
+            const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith;
+            wake = isAsleep_ && !isTurnTaken_ && !isLeftToHelper;
+            isAsleep_ &= !wake;
         }
+        if (mayHelp)
+            thisThread.toHelp = shared_from_this();
         if (wake) // not under the lock, which the woken thread wants first of all
             changed_.notifyOne();
     }
 
-    // No items are added any more, except by items.
+    // Nothing is added any more, except by items.
     void end()
     {
         const foundation::Lock lock(lock_);
@@ -39,59 +42,112 @@ public:
         changed_.notifyOne();
     }
 
-    // The thread's life.
+    // The life of the queue's thread.
     void run()
     {
-        ofThisThread_ = this;
-        std::vector<WorkItem> items;
-        while (take(items)) {
-            turnIsRunning = static_cast<bool>(turnEndHandler_);
-            for (WorkItem& item : items) {
-                item();
-                item = nullptr; // what it holds is released before the next one runs
-            }
-            turnIsRunning = false;
-            items.clear();
-            if (items.capacity() > mostRoomKept)
-                items = std::vector<WorkItem>();
-            if (turnEndHandler_)
-                turnEndHandler_();
-        }
+        while (waitForTurn())
+            runTurn();
     }
 
-    [[nodiscard]] bool isOfThisThread() const noexcept { return ofThisThread_ == this; }
+    // Runs one turn on another thread, unless the queue's thread is up and sees to it.
+    void help()
+    {
+        {
+            const foundation::Lock lock(lock_);
+            if (!isAsleep_ || isTurnTaken_ || waiting_.empty())
+                return;
+            takeTurn();
+        }
+        runTurn();
+    }
+
+    [[nodiscard]] bool isCurrent() const noexcept { return thisThread.runs == this; }
+    [[nodiscard]] static bool isTurnRunning() noexcept
+    {
+        return thisThread.runs != nullptr && thisThread.runs->turnEndHandler_ && !thisThread.isEndingTurn;
+    }
+
+    // What a thread has to do with serial queues.
+    struct ThisThread {
+        const Work* runs = nullptr;
+        bool isEndingTurn = false;
+        bool isHelper = false;
+        std::shared_ptr<Work> toHelp;
+
+        [[nodiscard]] bool mayHelp(const Work* work) const noexcept
+        {
+            return isHelper && runs == nullptr && (toHelp == nullptr || toHelp.get() == work);
+        }
+    };
+    static thread_local ThisThread thisThread;
 
 private:
-    // Waits for items and takes them all; false when there will be none.
-    bool take(std::vector<WorkItem>& items)
+    static constexpr std::size_t mostRoomKept = 1024; // in items; what a burst needed beyond that is given back
+
+    // False when there will be none.
+    bool waitForTurn()
     {
         const foundation::Lock lock(lock_);
-        while (waiting_.empty()) {
-            if (isEnding_)
+        while (waiting_.empty() || isTurnTaken_) {
+            if (isEnding_ && !isTurnTaken_)
                 return false;
             isAsleep_ = true;
             changed_.wait(lock_);
         }
         isAsleep_ = false;
-        items.swap(waiting_);
+        takeTurn();
         return true;
     }
 
-    static thread_local const Work* ofThisThread_;
+    void takeTurn() KESTO_REQUIRES(lock_)
+    {
+        isTurnTaken_ = true;
+        turn_.swap(waiting_);
+    }
+
+    void runTurn()
+    {
+        thisThread.runs = this;
+        for (WorkItem& item : turn_) {
+            item();
+            item = nullptr; // what it holds is released before the next one runs
+        }
+        turn_.clear();
+        if (turn_.capacity() > mostRoomKept)
+            turn_ = std::vector<WorkItem>();
+        if (turnEndHandler_) {
+            thisThread.isEndingTurn = true;
+            turnEndHandler_();
+            thisThread.isEndingTurn = false;
+        }
+        thisThread.runs = nullptr;
+        giveTurnBack();
+    }
+
+    void giveTurnBack()
+    {
+        const foundation::Lock lock(lock_);
+        isTurnTaken_ = false;
+        if (isAsleep_ && (isEnding_ || !waiting_.empty()))
+            changed_.notifyOne();
+    }
 
     const std::function<void()> turnEndHandler_;
+    const bool isInteractive_;
     foundation::Mutex lock_;
     foundation::Condition changed_;
     std::vector<WorkItem> waiting_ KESTO_GUARDED_BY(lock_);
-    bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // so that only who finds it asleep pays for waking it
+    std::vector<WorkItem> turn_; // of whoever has taken it
+    bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // somebody runs one
+    bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread, and nobody has woken it yet
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
 };
 
-thread_local const SerialQueue::Work* SerialQueue::Work::ofThisThread_ = nullptr;
+thread_local SerialQueue::Work::ThisThread SerialQueue::Work::thisThread;
 
 SerialQueue::SerialQueue(std::string_view name, QualityOfService quality, std::function<void()> turnEndHandler)
-    : work_(std::make_shared<Work>(std::move(turnEndHandler)))
-    , thread_(startThread(name, quality, [work = work_] { work->run(); }))
+    : work_(std::make_shared<Work>(std::move(turnEndHandler), quality == QualityOfService::UserInteractive)),
+      thread_(startThread(name, quality, [work = work_] { work->run(); }))
 {
 }
 
@@ -111,12 +167,30 @@ void SerialQueue::submit(WorkItem item)
 
 bool SerialQueue::isCurrent() const
 {
-    return work_->isOfThisThread();
+    return work_->isCurrent();
 }
 
 bool SerialQueue::isTurnRunning() noexcept
 {
-    return turnIsRunning;
+    return Work::isTurnRunning();
+}
+
+SerialQueue::Helper::Helper()
+{
+    assert(!Work::thisThread.isHelper);
+    Work::thisThread.isHelper = true;
+}
+
+SerialQueue::Helper::~Helper()
+{
+    help();
+    Work::thisThread.isHelper = false;
+}
+
+void SerialQueue::Helper::help()
+{
+    if (const auto work = std::exchange(Work::thisThread.toHelp, nullptr))
+        work->help();
 }
 
 } // namespace platform

@@ -1,8 +1,14 @@
-// A serial work queue: one thread that sleeps while there is nothing to do, and otherwise takes all that has
+// A serial work queue: a thread that sleeps while there is nothing to do, and otherwise takes all that has
 // gathered under one lock. What it takes at once is a turn.
 //
 // The end of a turn is the moment to do once what would be dear to do for every item, such as committing to
 // the disk and writing to sockets; whoever wants that gives the queue a turn-end handler.
+//
+// Waking a sleeping thread costs many times what an item does, and what one processor made another is slow to
+// take apart. So a thread that submits work and has nothing else to do then may offer its help: it runs the
+// turn of an interactive queue itself. Measured with a client that waits for each answer: 6 us a call instead
+// of 8; with one that does not wait: 515,000 calls a second instead of 280,000 to 450,000. A burst goes to the
+// queue's thread, and both threads work side by side. Either way one turn runs at a time.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -17,10 +23,13 @@ namespace platform {
 // Any thread.
 class SerialQueue final : public WorkQueue {
 public:
-    // The handler may be empty. It is called on the queue's thread after every turn, when the turn's items and
-    // all that they held are gone.
+    // Turns of up to so many items are run by a thread that helps: some milliseconds of its time.
+    static constexpr std::size_t mostItemsHelpedWith = 1024;
+
+    // The handler may be empty. It is called after every turn, when the turn's items and all that they held are
+    // gone, on the thread that ran them.
     SerialQueue(std::string_view name, QualityOfService quality, std::function<void()> turnEndHandler);
-    // Waits until everything submitted has been run. The queue may go while one of its own items runs: the
+    // Waits until everything submitted has been run. The queue may go while one of its own items runs: its
     // thread then ends by itself afterwards.
     ~SerialQueue() override;
     SerialQueue(const SerialQueue&) = delete;
@@ -31,6 +40,19 @@ public:
 
     // Whether the calling thread runs a turn for whose end a handler waits.
     [[nodiscard]] static bool isTurnRunning() noexcept;
+
+    // The calling thread helps as long as this lives. One a thread.
+    class Helper {
+    public:
+        Helper();
+        ~Helper();
+        Helper(const Helper&) = delete;
+        Helper& operator=(const Helper&) = delete;
+
+        // Runs the turn that this thread has submitted since the last time, if there is one and nobody else
+        // runs it. To be called when the thread would otherwise sleep.
+        void help();
+    };
 
 private:
     class Work;
