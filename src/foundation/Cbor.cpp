@@ -1,3 +1,5 @@
+// The writer is a head and the bytes behind it. The reader is one pass over foreign bytes, without look-ahead: it
+// recurses only into containers, which are counted, and trusts no length before the bytes are there.
 #include "foundation/Cbor.h"
 
 #include <algorithm>
@@ -259,23 +261,31 @@ private:
     {
         const Head head = readHead();
         switch (head.major) {
+        case Major::Bytes: return Data{String(readBytes(head))};
+        case Major::Text: return String(readText(head));
+        case Major::Array: return depth == 0 ? refuse(CborError::TooDeep) : readArray(head, depth - 1);
+        case Major::Map: return depth == 0 ? refuse(CborError::TooDeep) : readMap(head, depth - 1);
+        case Major::Tag: return readTagged(head);
+        default: return readScalar(head);
+        }
+    }
+
+    // What is whole with its head: integers and the simple values. Null for all else.
+    Value readScalar(const Head& head) noexcept
+    {
+        switch (head.major) {
         case Major::Unsigned:
             return std::in_range<std::int64_t>(head.argument) ? Value(static_cast<std::int64_t>(head.argument))
                                                               : Value(head.argument);
         case Major::Negative:
             return std::in_range<std::int64_t>(head.argument) ? Value(-1 - static_cast<std::int64_t>(head.argument))
                                                               : refuse(CborError::IntegerOutOfRange);
-        case Major::Bytes: return Data{String(readBytes(head))};
-        case Major::Text: return String(readText(head));
-        case Major::Array: return depth == 0 ? refuse(CborError::TooDeep) : readArray(head, depth - 1);
-        case Major::Map: return depth == 0 ? refuse(CborError::TooDeep) : readMap(head, depth - 1);
-        case Major::Tag: return readTagged(head);
-        case Major::Simple: return simpleValue(head);
+        case Major::Simple: return readSimple(head);
+        default: return {};
         }
-        return refuse(CborError::Malformed);
     }
 
-    Value simpleValue(const Head& head) noexcept
+    Value readSimple(const Head& head) noexcept
     {
         switch (head.additional) {
         case False: return false;
@@ -330,7 +340,7 @@ private:
     std::string_view readText(const Head& head)
     {
         const std::string_view text = readBytes(head);
-        if (!isValidUtf8(text))
+        if (!head.isIndefinite() && !isValidUtf8(text))
             fail(CborError::InvalidUtf8);
         return text;
     }
@@ -375,11 +385,10 @@ private:
     {
         if (head.argument != epochDateTag)
             return refuse(CborError::Unsupported);
-        const Value seconds = readItem(0);
-        const auto number = seconds.number();
-        if (!number || number->kind() == Number::Kind::Boolean)
+        const auto seconds = readScalar(readHead()).number(); // never another tag, or tags would nest without end
+        if (!seconds || seconds->kind() == Number::Kind::Boolean)
             return refuse(CborError::Malformed);
-        return Date{number->doubleValue()};
+        return Date{seconds->doubleValue()};
     }
 
     std::string_view rest_;

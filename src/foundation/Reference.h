@@ -32,7 +32,7 @@ template <typename Object> class Reference {
 public:
     constexpr Reference() noexcept = default;
 
-    // Takes over the owner that a new object starts with.
+    // Takes over the owner that a new object starts with; or nothing, given null.
     static Reference adopt(const Object* object) noexcept
     {
         Reference reference;

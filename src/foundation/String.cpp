@@ -1,3 +1,4 @@
+// One allocation a string, none for the empty one; and UTF-8 checked eight characters at a time.
 #include "foundation/String.h"
 
 #include <cstdint>
@@ -10,8 +11,7 @@ const StringObject* StringObject::create(std::string_view text)
 {
     void* memory = ::operator new(sizeof(StringObject) + text.size());
     auto* object = new (memory) StringObject(text.size());
-    if (!text.empty())
-        std::memcpy(static_cast<char*>(memory) + sizeof(StringObject), text.data(), text.size());
+    std::memcpy(static_cast<char*>(memory) + sizeof(StringObject), text.data(), text.size());
     return object;
 }
 
@@ -20,6 +20,11 @@ void StringObject::destroy(const StringObject* object) noexcept
     const std::size_t size = sizeof(StringObject) + object->size_;
     object->~StringObject();
     ::operator delete(const_cast<StringObject*>(object), size);
+}
+
+String::String(std::string_view text)
+    : object_(Reference<StringObject>::adopt(text.empty() ? nullptr : StringObject::create(text)))
+{
 }
 
 namespace {

@@ -36,14 +36,14 @@ private:
 class String {
 public:
     String() noexcept = default; // the empty string
-    String(std::string_view text) : object_(Reference<StringObject>::adopt(StringObject::create(text))) { }
+    String(std::string_view text);
     String(const char* text) : String(std::string_view(text)) { }
 
     [[nodiscard]] std::string_view view() const noexcept { return object_ ? object_->view() : std::string_view(); }
     operator std::string_view() const noexcept { return view(); }
     [[nodiscard]] bool empty() const noexcept { return view().empty(); }
 
-    // Whether both are one object; two empty default strings are.
+    // Whether both are one object; all empty strings are.
     [[nodiscard]] bool isSameObject(const String& other) const noexcept { return object_.get() == other.object_.get(); }
 
     friend bool operator==(const String& left, const String& right) noexcept

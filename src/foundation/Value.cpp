@@ -1,3 +1,7 @@
+// How values are shared, found, compared and read as something else.
+//
+// Empty strings, arrays and dictionaries have no object: a frame of a million empty arrays, which a hostile
+// client sends in a megabyte, costs no allocation an element.
 #include "foundation/Value.h"
 
 #include "foundation/Json.h"
@@ -5,6 +9,9 @@
 #include <algorithm>
 #include <charconv>
 #include <cmath>
+#include <ctime>
+#include <fmt/chrono.h>
+#include <iterator>
 #include <numeric>
 
 namespace foundation {
@@ -126,8 +133,8 @@ constexpr std::string_view blanks = " \t\n\v\f\r";
 double leadingNumber(std::string_view text) noexcept
 {
     text = withoutLeading(text, blanks);
-    if (text.starts_with('+'))
-        text.remove_prefix(1);
+    if (text.starts_with('+') && !text.starts_with("+-"))
+        text.remove_prefix(1); // from_chars knows no plus
     double number = 0;
     std::from_chars(text.data(), text.data() + text.size(), number);
     return std::isfinite(number) ? number : 0; // "inf" and "nan" are words, not numbers
@@ -140,6 +147,29 @@ bool leadingTruth(std::string_view text) noexcept
         text.remove_prefix(1);
     text = withoutLeading(text, "0");
     return !text.empty() && std::string_view("YyTt123456789").contains(text.front());
+}
+
+void appendBase64(std::string_view bytes, std::string& out)
+{
+    constexpr std::string_view alphabet = "ABCDEFGHIJKLMNOPQRSTUVWXYZabcdefghijklmnopqrstuvwxyz0123456789+/";
+    for (std::size_t at = 0; at < bytes.size(); at += 3) {
+        std::uint32_t group = 0;
+        for (std::size_t index = 0; index < 3; ++index)
+            group = group << 8 | (at + index < bytes.size() ? static_cast<std::uint8_t>(bytes[at + index]) : 0U);
+        for (std::size_t index = 0; index < 4; ++index)
+            out.push_back(at + index > bytes.size() ? '=' : alphabet[group >> (18 - 6 * index) & 63]);
+    }
+}
+
+// To the second. Years that do not have four digits are left as the number of seconds.
+void appendIso8601(double secondsSince1970, std::string& out)
+{
+    constexpr double firstSecondOfYear0 = -62167219200;
+    constexpr double firstSecondOfYear10000 = 253402300800;
+    if (!(secondsSince1970 >= firstSecondOfYear0 && secondsSince1970 < firstSecondOfYear10000))
+        return Number(secondsSince1970).appendText(out);
+    const auto seconds = static_cast<std::time_t>(std::floor(secondsSince1970));
+    fmt::format_to(std::back_inserter(out), "{:%Y-%m-%dT%H:%M:%SZ}", fmt::gmtime(seconds));
 }
 
 } // namespace
@@ -171,7 +201,10 @@ void Value::appendText(std::string& out) const
     case Kind::Null: out += "(null)"; break;
     case Kind::Number: numberUnchecked().appendText(out); break;
     case Kind::String: out += bytesUnchecked(); break;
-    default: appendJsonText(*this, out); break;
+    case Kind::Array:
+    case Kind::Dictionary: appendJsonText(*this, out); break;
+    case Kind::Data: appendBase64(bytesUnchecked(), out); break;
+    case Kind::Date: appendIso8601(date_, out); break;
     }
 }
 
@@ -191,7 +224,10 @@ bool operator==(const Value& left, const Value& right) noexcept
 
 // --- Array
 
-Array::Array(std::vector<Value> values) : object_(Reference<ArrayObject>::adopt(new ArrayObject(std::move(values)))) { }
+Array::Array(std::vector<Value> values)
+    : object_(Reference<ArrayObject>::adopt(values.empty() ? nullptr : new ArrayObject(std::move(values))))
+{
+}
 
 bool operator==(const Array& left, const Array& right) noexcept
 {
@@ -265,7 +301,7 @@ void DictionaryObject::indexAndFoldRepetitions()
 }
 
 Dictionary::Dictionary(Entries entries)
-    : object_(Reference<DictionaryObject>::adopt(new DictionaryObject(std::move(entries))))
+    : object_(Reference<DictionaryObject>::adopt(entries.empty() ? nullptr : new DictionaryObject(std::move(entries))))
 {
 }
 
