@@ -1,0 +1,154 @@
+// What is written is read back the same; and the heads that callers write by hand fit what values write.
+#include "foundation/Cbor.h"
+
+#include "foundation/GeneratedValues.h"
+#include "foundation/Hex.h"
+
+#include <gtest/gtest.h>
+#include <limits>
+#include <rapidcheck/gtest.h>
+#include <string>
+#include <string_view>
+
+namespace foundation {
+namespace {
+
+std::string encoded(const Value& value)
+{
+    std::string bytes;
+    appendCbor(value, bytes);
+    return bytes;
+}
+
+RC_GTEST_PROP(CborProperty, WhatIsWrittenIsReadBackByteForByte, ())
+{
+    const Value value = *generated::value();
+    const std::string bytes = encoded(value);
+    CborDecoder decoder;
+    const auto read = decoder.decode(bytes);
+    RC_ASSERT(read.has_value());
+    RC_ASSERT(*read == value);
+    RC_ASSERT(encoded(*read) == bytes); // equality forgives the kind of a number; this does not
+}
+
+RC_GTEST_PROP(CborProperty, AnythingAtAllIsReadOrRefused, (const std::string& bytes))
+{
+    CborDecoder decoder;
+    if (const auto read = decoder.decode(bytes)) {
+        const std::string again = encoded(*read);
+        RC_ASSERT(encoded(*decoder.decode(again)) == again);
+    }
+}
+
+// Random bytes are seldom near to CBOR; an item with one byte changed is.
+RC_GTEST_PROP(CborProperty, AnItemWithOneByteChangedIsReadOrRefused, (char byte))
+{
+    std::string bytes = encoded(*generated::value());
+    bytes[*rc::gen::inRange<std::size_t>(0, bytes.size())] = byte;
+    CborDecoder decoder;
+    if (const auto read = decoder.decode(bytes)) {
+        const std::string again = encoded(*read);
+        RC_ASSERT(encoded(*decoder.decode(again)) == again);
+    }
+}
+
+TEST(Cbor, HeadsAreTheShortest)
+{
+    for (const auto& [value, hex] : std::initializer_list<std::pair<std::uint64_t, std::string_view>>{
+             {23, "17"},
+             {24, "1818"},
+             {255, "18ff"},
+             {256, "190100"},
+             {65535, "19ffff"},
+             {65536, "1a00010000"},
+             {4294967295, "1affffffff"},
+             {4294967296, "1b0000000100000000"},
+         }) {
+        EXPECT_EQ(toHex(encoded(value)), hex);
+        EXPECT_EQ(toHex(encoded(static_cast<std::int64_t>(value))), hex);
+        std::string integer;
+        appendCborInteger(value, integer);
+        EXPECT_EQ(toHex(integer), hex);
+    }
+    EXPECT_EQ(toHex(encoded(std::numeric_limits<std::int64_t>::min())), "3b7fffffffffffffff");
+}
+
+TEST(Cbor, LongerHeadsAreReadAllTheSame)
+{
+    CborDecoder decoder;
+    EXPECT_EQ(*decoder.decode(fromHex("1b0000000000000001")), Value(1));
+    EXPECT_EQ(*decoder.decode(fromHex("9a00000001190001")), Value(Array{1}));
+    EXPECT_EQ(*decoder.decode(fromHex("b9000178016101")), Value(Dictionary{{"a", 1}}));
+}
+
+TEST(Cbor, AMessageWrittenByHandIsTheMessageWrittenAsAValue)
+{
+    std::string bytes;
+    appendCborArrayHead(3, bytes);
+    appendCborInteger(7, bytes);
+    appendCborNull(bytes);
+    appendCborMapHead(1, bytes);
+    appendCborText("mute", bytes);
+    appendCborText("no", bytes);
+    EXPECT_EQ(bytes, encoded(Array{7U, Value(), Dictionary{{"mute", "no"}}}));
+}
+
+TEST(Cbor, SizeIsThatOfTheEncoding)
+{
+    const Dictionary dictionary{{"gain", 0.5F}, {"devices", Array{"Speaker"}}};
+    EXPECT_EQ(cborSize(dictionary), encoded(dictionary).size());
+}
+
+TEST(Cbor, IsAppended)
+{
+    std::string bytes = "before";
+    appendCbor(Dictionary{{"a", 1}}, bytes);
+    EXPECT_EQ(bytes, "before\xA1\x61\x61\x01");
+}
+
+TEST(Cbor, OfRepeatedKeysTheLaterWinsInTheFirstPlace)
+{
+    CborDecoder decoder;
+    const auto read = decoder.decode(fromHex("a3616101616202616103"));
+    ASSERT_TRUE(read);
+    EXPECT_EQ(toHex(encoded(*read)), "a2616103616202");
+}
+
+TEST(Cbor, IndefiniteLengthsNest)
+{
+    CborDecoder decoder;
+    const auto read = decoder.decode(fromHex("bf7f616b6131ff9f5f4101ff7fff5fffffff"));
+    ASSERT_TRUE(read) << description(read.error());
+    EXPECT_EQ(*read, Value(Dictionary{{"k1", Array{Data{"\x01"}, "", Data{}}}}));
+}
+
+TEST(Cbor, TheKeysOfLaterMessagesAreTheSameObjects)
+{
+    CborDecoder decoder;
+    const std::string bytes = encoded(Dictionary{{"PomoSessionVolume", "PomoSessionVolume"}});
+    const Dictionary first = *decoder.decode(bytes)->dictionary();
+    const Dictionary second = *decoder.decode(bytes)->dictionary();
+    EXPECT_TRUE(first.entries()[0].key.isSameObject(second.entries()[0].key));
+    EXPECT_FALSE(first.entries()[0].value.string()->isSameObject(second.entries()[0].key)) << "values are not keys";
+}
+
+TEST(Cbor, ManyKeysAndLongOnesAreReadRightThoughNotRemembered)
+{
+    CborDecoder decoder;
+    Dictionary::Entries entries{{String(std::string(5000, 'k')), 1}, {"", 2}};
+    for (int number = 0; number < 3000; ++number)
+        entries.push_back({String("key" + std::to_string(number)), number});
+    const Dictionary dictionary(std::move(entries));
+    for (int turn = 0; turn < 2; ++turn)
+        EXPECT_EQ(*decoder.decode(encoded(dictionary)), Value(dictionary));
+}
+
+TEST(Cbor, ADecoderGoesOnAfterAnError)
+{
+    CborDecoder decoder;
+    EXPECT_FALSE(decoder.decode("\x7F\x61\x61"));
+    EXPECT_EQ(*decoder.decode(fromHex("7f6162ff")), Value("b"));
+}
+
+} // namespace
+} // namespace foundation
