@@ -3,10 +3,23 @@
 
 #include <expected>
 #include <filesystem>
+#include <memory>
 #include <string_view>
 #include <system_error>
 
 namespace platform {
+
+// A file in the making. It takes the place of what stands under its name when it is committed, whole or not at
+// all; destroyed before that, it leaves nothing behind. One thread at a time.
+class AtomicFile {
+public:
+    virtual ~AtomicFile() = default;
+    // Appends text. A failure is remembered for `commit`.
+    virtual void write(std::string_view text) = 0;
+    // Begins again with an empty file.
+    virtual void clear() = 0;
+    [[nodiscard]] virtual std::expected<void, std::error_code> commit() = 0;
+};
 
 // Any thread.
 class FileSystem {
@@ -17,9 +30,8 @@ public:
     // Makes the folder and those above it that are missing, with exactly these permissions whatever the umask.
     [[nodiscard]] virtual std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
                                                                                  unsigned permissions) = 0;
-    // Puts the text in place of what stands there, whole or not at all.
-    [[nodiscard]] virtual std::expected<void, std::error_code> writeAtomically(const std::filesystem::path& path,
-                                                                               std::string_view text) = 0;
+    [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>
+    createAtomically(const std::filesystem::path& path) = 0;
 };
 
 } // namespace platform

@@ -9,6 +9,7 @@
 #include "platform/Clock.h"
 #include "platform/DeviceProperties.h"
 #include "platform/FeatureFlags.h"
+#include "platform/FileSystem.h"
 #include "platform/KernelTrace.h"
 #include "platform/Log.h"
 #include "platform/Notifications.h"
@@ -37,6 +38,7 @@ struct Platform {
     BugCapture& bugCapture;
     KernelTrace& kernelTrace;
     PerformanceWriter& performanceWriter;
+    FileSystem& fileSystem;
 };
 
 // Makes the platform current. While it is being changed nothing else may use it.

@@ -3,6 +3,7 @@
 
 #include "foundation/Cbor.h"
 #include "platform/Platform.h"
+#include "sinks/KestoReportingFennicBridge.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -79,7 +80,7 @@ void KestoReportingSession::start()
     messagesLost_ = 0;
     {
         const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        nestedAggregatedPayloadData_ = std::make_unique<KestoReportingMessageStore>(budget_);
+        nestedAggregatedPayloadData_ = std::make_unique<KestoReportingMessageStore>(budget_, rapidMessageKeys);
     }
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStarted);
 }
@@ -91,6 +92,9 @@ void KestoReportingSession::stop()
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStopping);
+    sendVolumeEvents();
+    writeSummaryJson();
+    sendSummaryEvent();
     if (messagesLost_ != 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for want of memory", reporterID_,
                   messagesLost_);
@@ -99,4 +103,33 @@ void KestoReportingSession::stop()
         nestedAggregatedPayloadData_.reset();
     }
     started_ = false;
+}
+
+void KestoReportingSession::sendVolumeEvents()
+{
+    const auto application = KestoReportingUtilityRetrieveAppName(configuration());
+    const auto process = application.isNull() ? std::nullopt : std::optional(application);
+    const double minimumPlaytime = KestoReportingUtilityVolumeMinimumPlayingTime(serviceType_);
+    std::vector<foundation::Dictionary> volumeEvents;
+    {
+        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+        volumeEvents = createVolumeMessages(*nestedAggregatedPayloadData_, process, minimumPlaytime);
+    }
+    if (volumeEvents.empty())
+        return;
+    KESTO_LOG(KestoReportingSessionCategory(), Default, "sending volume event for reporter {}", reporterID_);
+    for (const auto& volumeEvent : volumeEvents) {
+        sendMessage(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
+        KestoReportingFennicBridge::handleEvent(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,
+                                                shared_from_this());
+    }
+}
+
+void KestoReportingSession::sendSummaryEvent()
+{
+    const auto summary = createSummaryEventForSession();
+    if (!summary)
+        return;
+    KESTO_LOG(KestoReportingSessionCategory(), Default, "sending summary event for reporter {}", reporterID_);
+    sendMessage(*summary, AudioEventCategoryUndefined, AudioEventTypeUnknown, true, nullptr);
 }

@@ -24,8 +24,10 @@
 // sends never is this object.
 extern const foundation::String KestoReportingTraceTypeKtrace;
 
-// Driven from the server queue. What sinks read (service type, configuration) may be read from any thread.
-class KestoReportingSession final : public KestoReportingSinkSession {
+// Owned by a shared pointer. Driven from the server queue. What sinks read (service type, configuration) may be read
+// from any thread.
+class KestoReportingSession final : public KestoReportingSinkSession,
+                                    public std::enable_shared_from_this<KestoReportingSession> {
 public:
     // The identity never changes. The first process is the session's owner. Recorded messages are paid from
     // the budget.
@@ -87,6 +89,11 @@ public:
     createVolumeMessages(const KestoReportingMessageStore& messages, const std::optional<foundation::Value>& process,
                          double minimumPlaytime);
 
+    // For every key of this run's messages all values that it took, joined by commas; nothing without messages.
+    [[nodiscard]] std::optional<foundation::Dictionary> createSummaryEventForSession() const;
+    // On internal builds writes this run's messages to a file below the diagnostic-log root. What fails is logged.
+    void writeSummaryJson() const;
+
     // The reply of the call that started this run, kept by the client instance until its work is done.
     [[nodiscard]] const KestoReportingResultReply<bool>& transactionCompleteBlock() const
     {
@@ -119,6 +126,10 @@ public:
     [[nodiscard]] static bool shouldReportOrientation() { return false; }
 
 private:
+    [[nodiscard]] std::string summaryFileName() const;
+    void sendVolumeEvents();
+    void sendSummaryEvent();
+
     bool started_ = false;
     bool blinReportingEnabled_ = false;
     std::atomic<AudioServiceType> serviceType_{0};

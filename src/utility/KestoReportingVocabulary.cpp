@@ -37,7 +37,6 @@ constexpr std::array<std::string_view, 19> typeNames{"Generic",
                                                      "Simple",
                                                      "Histogram",
                                                      "State"};
-constexpr AudioEventType typeUnknown = 65535;
 
 constexpr std::array<std::string_view, 14> serviceNames{
     "generic",         "merla",         "telephony",        "haptics",          "alarms", "standalone",
@@ -73,7 +72,7 @@ std::string KestoReportingUtilityCategoryString(AudioEventCategory category)
 
 std::string_view KestoReportingUtilityTypeString(AudioEventType type)
 {
-    if (type == typeUnknown)
+    if (type == AudioEventTypeUnknown)
         return "Unknown";
     return typeNames[type < typeNames.size() ? type : 0];
 }

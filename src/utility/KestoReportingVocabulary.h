@@ -17,8 +17,12 @@ using AudioServiceType = std::uint16_t;
 
 constexpr AudioEventCategory AudioEventCategorySetup = 8;
 constexpr AudioEventCategory AudioEventCategoryError = 11;
+constexpr AudioEventCategory AudioEventCategoryVolume = 14;
+constexpr AudioEventCategory AudioEventCategoryUndefined = 0xFFFFFFFF;
 constexpr AudioEventType AudioEventTypeSetup = 5;
 constexpr AudioEventType AudioEventTypeError = 6;
+constexpr AudioEventType AudioEventTypeSummary = 11;
+constexpr AudioEventType AudioEventTypeUnknown = 65535;
 constexpr AudioServiceType AudioServiceTypeAlarms = 4;
 constexpr AudioServiceType AudioServiceTypeStandalone = 5;
 constexpr AudioServiceType AudioServiceTypeUnknown = 65535;

@@ -27,14 +27,34 @@ public:
         directories.try_emplace(path, permissions);
         return {};
     }
-    std::expected<void, std::error_code> writeAtomically(const std::filesystem::path& path,
-                                                         std::string_view text) override
+    std::expected<std::unique_ptr<platform::AtomicFile>, std::error_code>
+    createAtomically(const std::filesystem::path& path) override
     {
-        if (writeError)
-            return std::unexpected(writeError);
-        files.insert_or_assign(path, std::string(text));
-        return {};
+        return std::make_unique<File>(*this, path);
     }
+
+private:
+    class File final : public platform::AtomicFile {
+    public:
+        File(FakeFileSystem& fileSystem, std::filesystem::path path) : fileSystem_(fileSystem), path_(std::move(path))
+        {
+        }
+
+        void write(std::string_view text) override { text_ += text; }
+        void clear() override { text_.clear(); }
+        std::expected<void, std::error_code> commit() override
+        {
+            if (fileSystem_.writeError)
+                return std::unexpected(fileSystem_.writeError);
+            fileSystem_.files.insert_or_assign(path_, text_);
+            return {};
+        }
+
+    private:
+        FakeFileSystem& fileSystem_;
+        const std::filesystem::path path_;
+        std::string text_;
+    };
 };
 
 class FakePerformanceWriter final : public platform::PerformanceWriter {

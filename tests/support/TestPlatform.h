@@ -34,7 +34,8 @@ public:
                            .reportingChannels = reportingChannels,
                            .bugCapture = bugCapture,
                            .kernelTrace = kernelTrace,
-                           .performanceWriter = performanceWriter});
+                           .performanceWriter = performanceWriter,
+                           .fileSystem = fileSystem});
     }
 
     ~TestPlatform()

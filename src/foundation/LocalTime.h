@@ -1,0 +1,12 @@
+// Local time as text, for names and tables that people read.
+#pragma once
+
+#include <string>
+#include <string_view>
+
+namespace foundation {
+
+// The moment in the device's time zone, by a chrono format of {fmt} such as "{:%H:%M:%S}". Any thread.
+[[nodiscard]] std::string localTimeText(double secondsSince1970, std::string_view format);
+
+} // namespace foundation

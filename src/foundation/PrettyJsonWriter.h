@@ -1,0 +1,36 @@
+// JSON for people, written piece by piece: indented, one member a line, and never in memory as a whole.
+#pragma once
+
+#include "foundation/CborView.h"
+#include "foundation/Value.h"
+
+#include <functional>
+#include <memory>
+#include <string_view>
+
+namespace foundation {
+
+// Calls come in the order of the text; one thread at a time.
+class PrettyJsonWriter {
+public:
+    using Sink = std::function<void(std::string_view text)>;
+
+    // The sink gets the text in pieces of some 64 KiB, the last when the writer is destroyed.
+    explicit PrettyJsonWriter(Sink sink);
+    ~PrettyJsonWriter();
+
+    void beginArray();
+    void endArray();
+    void beginObject();
+    void endObject();
+    void key(std::string_view key);
+    // False when the value holds NaN or infinity, which JSON cannot say; the text is then of no use.
+    [[nodiscard]] bool write(const Value& value);
+    [[nodiscard]] bool write(CborItem item);
+
+private:
+    class Implementation;
+    std::unique_ptr<Implementation> implementation_;
+};
+
+} // namespace foundation
