@@ -155,7 +155,7 @@ typedef struct kesto_message kesto_message;
 // How many arrays and dictionaries may stand inside each other, the message itself not counted.
 #define KESTO_DEEPEST_NESTING 30
 // How many bytes of keys and values a message takes, encoded.
-#define KESTO_LARGEST_MESSAGE (1024 * 1024 - 64)
+#define KESTO_LARGEST_MESSAGE (1024 * 1024 - 1024)
 
 // An empty message, or null when there is no memory.
 KESTO_API kesto_message* kesto_message_create(void);
@@ -223,7 +223,7 @@ typedef enum kesto_operation {
 
 // One answer to one call. Valid during the callback only. Later versions may add fields at the end.
 typedef struct kesto_answer {
-    uint64_t call; // the number of the call on its connection
+    uint64_t call; // the number of the call: they are counted as they leave the queue, from 1
     kesto_operation operation;
     kesto_reporter reporter; // that the call was for; 0 for those that name none, and for `send`
     const char* error_domain; // null when all is well, and then the result below is valid
@@ -258,7 +258,8 @@ typedef enum kesto_state {
 // Valid during the callback only. Later versions may add fields at the end.
 typedef struct kesto_state_change {
     kesto_state state;
-    // Why it is disconnected: KESTO_CONNECT_FAILED, KESTO_CONNECTION_LOST or KESTO_PROTOCOL_VIOLATION; else KESTO_OK.
+    // Why it is disconnected: KESTO_CONNECT_FAILED, KESTO_CONNECTION_LOST, KESTO_PROTOCOL_VIOLATION or
+    // KESTO_OUT_OF_MEMORY; else KESTO_OK.
     kesto_status reason;
     int system_error; // `errno` of that reason where the system gave one, else 0
     uint32_t retry_after_ms; // when disconnected: how long until the next attempt; UINT32_MAX: there will be none
@@ -303,15 +304,17 @@ typedef struct kesto_options {
 } kesto_options;
 
 // Makes a client, whose thread at once begins to connect; calls may be made right away and wait for the connection.
-// Does not block. Null options: the defaults. On failure `*client` is null: KESTO_INVALID_ARGUMENT (a service name
-// with a slash, a path longer than a socket's address), KESTO_OUT_OF_MEMORY or KESTO_SYSTEM_ERROR (with `errno`).
+// Does not block. `*client` is set before the first callback, which may use it. Null options: the defaults. On failure
+// `*client` is null: KESTO_INVALID_ARGUMENT (a service name with a slash, a path longer than a socket's address),
+// KESTO_OUT_OF_MEMORY or KESTO_SYSTEM_ERROR (with `errno`).
 KESTO_API kesto_status kesto_client_open(const kesto_options* options, kesto_client** client);
 
 // Refuses further calls, gives what was taken so far up to `timeout_ms` to be sent and answered (starts of sessions
 // aside), and ends the connection, upon which the service stops the client's sessions. What is still unanswered
-// gets KESTO_CLOSED. When it returns, all callbacks have been called and released. A second close does nothing.
-// KESTO_TIMED_OUT or KESTO_CONNECTION_LOST when not everything was answered; closed it is in any case, unless it was
-// called from a callback: KESTO_WRONG_THREAD.
+// gets KESTO_CLOSED. When it returns, all callbacks have been called and released; only a call that another thread
+// makes at the same moment may be left to `kesto_client_free`. A second close does nothing. KESTO_TIMED_OUT,
+// KESTO_CONNECTION_LOST or KESTO_NOT_CONNECTED when not everything may have been answered; with 0 nothing is waited
+// for. It is closed in any case, unless it was called from a callback: KESTO_WRONG_THREAD.
 KESTO_API kesto_status kesto_client_close(kesto_client* client, uint32_t timeout_ms);
 
 // Closes the client without waiting for answers, if it is not closed yet, and frees it. No other thread may be using
@@ -366,9 +369,10 @@ KESTO_API kesto_status kesto_client_start_session(kesto_client* client, kesto_re
 // an empty one for none. The message may be reused at once. Answered without a result.
 //
 // For real-time threads: no lock, no allocation, no wait, and no system call as long as a session that this client
-// started has not been stopped or destroyed (counted from the return of start to the call of stop or destroy). When no
-// session is started and the client's thread sleeps, the first send wakes it with one write to an event descriptor and
-// those that follow do not; the thread sleeps again when all is answered. `wake_on_send` changes that.
+// started has not been stopped, destroyed or created anew, or lost with its connection (counted from the return of
+// start to the call of stop, destroy or create). When no session is started and the client's thread sleeps, the first
+// send wakes it with one write to an event descriptor, and those that follow make no system call until all is answered
+// and it sleeps again. `wake_on_send` changes that.
 //
 // A message that is not taken is counted by reason: KESTO_QUEUE_FULL, KESTO_NOT_CONNECTED (and KESTO_CLOSED), or
 // KESTO_TOO_LARGE and whatever else makes it impossible to send.

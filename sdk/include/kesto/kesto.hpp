@@ -389,6 +389,13 @@ struct Options {
 class Client {
 public:
     Client() noexcept = default;
+    Client(Client&& other) noexcept : client_(std::exchange(other.client_, nullptr)) { }
+    Client& operator=(Client&& other) noexcept
+    {
+        std::swap(client_, other.client_);
+        return *this;
+    }
+    ~Client() { kesto_client_free(client_); }
 
     // Begins to connect, without waiting; calls may be made right away. A client that was open before is closed.
     // InvalidArgument, OutOfMemory or SystemError when it cannot be.
@@ -409,11 +416,8 @@ public:
             given.state_user = new StateCallback(options.stateChanged);
             given.state_release = release<StateCallback>;
         }
-        client_.reset();
-        kesto_client* client = nullptr;
-        const auto status = Status(kesto_client_open(&given, &client));
-        client_.reset(client);
-        return status;
+        kesto_client_free(client_);
+        return Status(kesto_client_open(&given, &client_)); // sets it before the first callback, which may use it
     }
 
     [[nodiscard]] bool isOpen() const noexcept { return client_ != nullptr; }
@@ -504,7 +508,7 @@ public:
         return call(std::move(callback), kesto_client_kill_service);
     }
 
-    [[nodiscard]] kesto_client* get() const noexcept { return client_.get(); }
+    [[nodiscard]] kesto_client* get() const noexcept { return client_; }
 
 private:
     static std::uint32_t milliseconds(std::chrono::milliseconds duration) noexcept
@@ -537,10 +541,7 @@ private:
         return Status(function(get(), arguments..., callAnswer, user, release<AnswerCallback>));
     }
 
-    struct Free {
-        void operator()(kesto_client* client) const noexcept { kesto_client_free(client); }
-    };
-    std::unique_ptr<kesto_client, Free> client_;
+    kesto_client* client_ = nullptr;
 };
 
 } // namespace kesto
