@@ -1,0 +1,247 @@
+#include "platform/linux/AnalyticsStore.h"
+
+#include "platform/linux/Thread.h"
+
+#include <future>
+#include <iterator>
+#include <numeric>
+#include <utility>
+
+namespace platform {
+
+using foundation::Dictionary;
+using foundation::Value;
+
+namespace {
+
+constexpr std::size_t mostRoomKept = 1024; // in events; what a burst needed beyond that is given back
+constexpr std::size_t bytesOfAnObject = 48; // what a shared object takes beside its content
+
+std::size_t roughBytes(const Dictionary& dictionary);
+
+// What a value takes, roughly: the backlog is bounded by it, not accounted to the byte.
+std::size_t roughBytes(const Value& value)
+{
+    std::size_t bytes = sizeof value;
+    if (const auto string = value.string())
+        bytes += bytesOfAnObject + string->view().size();
+    else if (const auto data = value.data())
+        bytes += bytesOfAnObject + data->bytes.view().size();
+    else if (const auto dictionary = value.dictionary())
+        bytes += roughBytes(*dictionary);
+    else if (const auto array = value.array())
+        for (const Value& each : *array)
+            bytes += roughBytes(each);
+    return bytes;
+}
+
+std::size_t roughBytes(const Dictionary& dictionary)
+{
+    std::size_t bytes = bytesOfAnObject;
+    for (const auto& [key, value] : dictionary)
+        bytes += bytesOfAnObject + key.view().size() + roughBytes(value);
+    return bytes;
+}
+
+} // namespace
+
+// --- Batches
+
+// Two events in a row often share their payload.
+void AnalyticsStore::Batch::add(AnalyticsEvent event)
+{
+    bytes += sizeof event + event.name.size();
+    if (events.empty() || !events.back().payload.isSameObject(event.payload))
+        bytes += roughBytes(event.payload);
+    events.push_back(std::move(event));
+}
+
+void AnalyticsStore::Batch::takeFrom(Batch& other)
+{
+    if (empty()) {
+        std::swap(*this, other);
+        return;
+    }
+    std::ranges::move(other.events, std::back_inserter(events));
+    std::ranges::move(other.whenKept, std::back_inserter(whenKept));
+    bytes += other.bytes;
+    other.clear();
+}
+
+void AnalyticsStore::Batch::clear()
+{
+    events.clear();
+    if (events.capacity() > mostRoomKept)
+        events = std::vector<AnalyticsEvent>();
+    whenKept.clear();
+    if (whenKept.capacity() > mostRoomKept)
+        whenKept = std::vector<WhenKept>();
+    bytes = 0;
+}
+
+bool AnalyticsStore::isRoomIn(const Batch& batch) const noexcept
+{
+    return batch.events.size() + batch.whenKept.size() < limits_.mostEvents && batch.bytes < limits_.mostBytes;
+}
+
+// --- What others call
+
+AnalyticsStore::AnalyticsStore(const std::filesystem::path& stateDirectory, ConfigurationWatcher& watcher,
+                               const Clock& clock, ProviderLog log, Limits limits)
+    : clock_(clock),
+      log_(log),
+      limits_(limits),
+      writer_(stateDirectory, clock, log),
+      configurationFile_(watcher, "analytics.toml", log, [this] { applyConfiguration(); })
+{
+    applyConfiguration();
+    thread_ = startThread("analytics", QualityOfService::Default, [this] { run(); });
+}
+
+AnalyticsStore::~AnalyticsStore()
+{
+    {
+        const foundation::Lock lock(lock_);
+        waiting_.takeFrom(turn_);
+        isEnding_ = true;
+        wakeWriter();
+    }
+    thread_.join();
+}
+
+void AnalyticsStore::sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder)
+{
+    AnalyticsEvent event{clock_.secondsSince1970(), std::move(eventName), payloadBuilder()};
+    const foundation::Lock lock(lock_);
+    if (std::this_thread::get_id() == turnThread_) {
+        turn_.add(std::move(event));
+        if (isRoomIn(turn_))
+            return;
+        waiting_.takeFrom(turn_); // a turn that is too large is written in parts
+    } else {
+        waiting_.add(std::move(event));
+    }
+    wakeWriter();
+    waitForRoom();
+}
+
+void AnalyticsStore::endTurn(WhenKept whenKept)
+{
+    {
+        const foundation::Lock lock(lock_);
+        turnThread_ = std::this_thread::get_id();
+        if (!isEverythingKept()) {
+            waiting_.takeFrom(turn_);
+            if (whenKept)
+                waiting_.whenKept.push_back(std::move(whenKept));
+            wakeWriter();
+            waitForRoom();
+            return;
+        }
+    }
+    if (whenKept)
+        whenKept();
+}
+
+void AnalyticsStore::flush()
+{
+    std::promise<void> kept;
+    {
+        const foundation::Lock lock(lock_);
+        if (isEverythingKept())
+            return;
+        waiting_.takeFrom(turn_);
+        waiting_.whenKept.emplace_back([&kept] { kept.set_value(); });
+        wakeWriter();
+    }
+    kept.get_future().wait();
+}
+
+// --- Between them and the store's thread
+
+// Reads the values anew, so that whoever comes last applies the last.
+void AnalyticsStore::applyConfiguration()
+{
+    std::vector<std::string> problems;
+    {
+        const foundation::Lock lock(lock_);
+        auto checked = readAnalyticsConfiguration(configurationFile_.values());
+        names_.setPatterns(checked.configuration.used);
+        newConfiguration_ = std::move(checked.configuration);
+        problems = std::move(checked.problems);
+        wakeWriter();
+    }
+    for (const std::string& problem : problems)
+        log_.error("{}: {}; the default counts until this is corrected", configurationFile_.path().native(), problem);
+}
+
+bool AnalyticsStore::isEverythingKept() const
+{
+    return turn_.empty() && waiting_.empty() && !isWriting_;
+}
+
+void AnalyticsStore::wakeWriter()
+{
+    if (std::exchange(isAsleep_, false))
+        changed_.notifyOne();
+}
+
+void AnalyticsStore::waitForRoom()
+{
+    while (!isRoomIn(waiting_))
+        room_.wait(lock_);
+}
+
+// --- The store's thread
+
+void AnalyticsStore::run()
+{
+    Batch batch;
+    for (bool isFirst = true; take(batch); isFirst = false) {
+        if (isFirst)
+            writer_.open();
+        writer_.keep(batch.events);
+        for (WhenKept& whenKept : batch.whenKept)
+            whenKept();
+        finish();
+        batch.clear();
+        while (writer_.maintain() && isIdle()) { }
+    }
+}
+
+// Waits for something to write, or to do, and takes all of it; false at the end.
+bool AnalyticsStore::take(Batch& batch)
+{
+    std::optional<AnalyticsConfiguration> configuration;
+    {
+        const foundation::Lock lock(lock_);
+        while (waiting_.empty() && !newConfiguration_) {
+            if (isEnding_)
+                return false;
+            isAsleep_ = true;
+            changed_.wait(lock_);
+        }
+        isAsleep_ = false;
+        std::swap(configuration, newConfiguration_);
+        std::swap(batch, waiting_);
+        isWriting_ = true;
+        room_.notifyAll();
+    }
+    if (configuration)
+        writer_.setConfiguration(*configuration);
+    return true;
+}
+
+void AnalyticsStore::finish()
+{
+    const foundation::Lock lock(lock_);
+    isWriting_ = false;
+}
+
+bool AnalyticsStore::isIdle()
+{
+    const foundation::Lock lock(lock_);
+    return waiting_.empty() && !newConfiguration_ && !isEnding_;
+}
+
+} // namespace platform

@@ -1,0 +1,297 @@
+#include "platform/linux/EventWriter.h"
+
+#include "foundation/Json.h"
+
+#include <algorithm>
+#include <array>
+#include <fmt/chrono.h>
+#include <limits>
+#include <set>
+#include <system_error>
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr std::size_t mostPayloadRoomKept = 256 * 1024; // in bytes; what a burst needed beyond that is given back
+constexpr std::uint64_t bytesShrunkAtOnce = 1024 * 1024;
+constexpr double secondsADay = 86400;
+
+fs::path withSuffix(const fs::path& path, std::string_view suffix)
+{
+    return fs::path(path).concat(suffix);
+}
+
+constexpr std::string_view damagedMark = ".corrupt-";
+constexpr std::string_view newerMark = ".newer-";
+
+// What SQLite has beside a database, under the same name and these ends.
+constexpr std::array<std::string_view, 2> companions = {"-wal", "-shm"};
+
+} // namespace
+
+EventWriter::EventWriter(const fs::path& directory, const Clock& clock, ProviderLog log)
+    : path_(directory / fileName),
+      clock_(clock),
+      log_(log),
+      losses_(path_, clock, log)
+{
+}
+
+void EventWriter::setConfiguration(const AnalyticsConfiguration& configuration)
+{
+    configuration_ = configuration;
+    hasMoreToTidy_ = true; // perhaps
+    if (database_)
+        if (const auto done = database_->setSynchronization(configuration_.synchronization); !done)
+            handleFailure(done.error());
+}
+
+std::uint64_t EventWriter::maximumBytes() const noexcept
+{
+    return configuration_.maximumSizeMegabytes * 1024 * 1024;
+}
+
+// --- Opening
+
+void EventWriter::open()
+{
+    if (const auto done = ensureOpen(); !done) {
+        const auto [problem, remedy] = words(done.error());
+        log_.error("analytics events cannot be kept: {}: {}; {}", path_.native(), problem, remedy);
+    }
+}
+
+EventWriter::Expected<> EventWriter::ensureOpen()
+{
+    if (database_ && !database_->wasReplaced())
+        return {};
+    if (database_) {
+        log_.error("{} was taken away; events are kept in the one that is there now, or in a new one", path_.native());
+        database_.reset();
+    } else if (clock_.systemUptime() < openAgainAt_) {
+        return std::unexpected(openError_);
+    }
+    const auto done = openAnew();
+    if (!done) {
+        openError_ = done.error();
+        openAgainAt_ = clock_.systemUptime() + secondsBetweenOpenings;
+    }
+    return done;
+}
+
+EventWriter::Expected<> EventWriter::openAnew()
+{
+    auto opened = EventDatabase::open(path_);
+    if (!opened && (opened.error() == StoreError::Corrupt || opened.error() == StoreError::Newer)
+        && setAside(opened.error()))
+        opened = EventDatabase::open(path_);
+    if (!opened)
+        return std::unexpected(opened.error());
+    database_ = std::move(*opened);
+    logBytesAtCheckpoint_ = 0;
+    return database_->setSynchronization(configuration_.synchronization);
+}
+
+// Renames the database, which is closed. One that is newer is good, and is never removed.
+bool EventWriter::setAside(StoreError reason)
+{
+    const bool isNewer = reason == StoreError::Newer;
+    if (!isNewer)
+        removeOldestDamaged();
+    const auto now = static_cast<std::time_t>(clock_.secondsSince1970());
+    const fs::path wanted =
+        withSuffix(path_, fmt::format("{}{:%Y%m%dT%H%M%SZ}", isNewer ? newerMark : damagedMark, fmt::gmtime(now)));
+    fs::path target = wanted;
+    std::error_code error;
+    for (int number = 2; fs::exists(target, error); ++number)
+        target = withSuffix(wanted, fmt::format(".{}", number));
+
+    fs::rename(path_, target, error);
+    if (error)
+        return false;
+    for (const std::string_view suffix : companions) {
+        std::error_code isNotThere;
+        fs::rename(withSuffix(path_, suffix), withSuffix(target, suffix), isNotThere);
+    }
+    log_.error("{} {}; it is now {}, and a new one is begun", path_.native(),
+               isNewer ? "was made by a later version of the service" : "is damaged or no database of events",
+               target.native());
+    return true;
+}
+
+void EventWriter::removeOldestDamaged()
+{
+    std::set<fs::path> damaged; // oldest first, for the time is in the name
+    std::error_code error;
+    for (fs::directory_iterator file(path_.parent_path(), error); file != end(file); file.increment(error)) {
+        const std::string name = file->path().filename();
+        const auto isCompanion = [&name](std::string_view suffix) { return name.ends_with(suffix); };
+        if (name.starts_with(fmt::format("{}{}", fileName, damagedMark))
+            && std::ranges::none_of(companions, isCompanion))
+            damaged.insert(file->path());
+    }
+    for (; damaged.size() >= mostDamagedKept; damaged.erase(damaged.begin())) {
+        fs::remove(*damaged.begin(), error);
+        for (const std::string_view suffix : companions)
+            fs::remove(withSuffix(*damaged.begin(), suffix), error);
+    }
+}
+
+// --- Keeping
+
+void EventWriter::keep(std::span<const AnalyticsEvent> events)
+{
+    if (events.empty())
+        return;
+    auto kept = write(events);
+    if (!kept && kept.error() == StoreError::Corrupt)
+        kept = write(events); // into the new one
+    if (kept) {
+        kept_ += *kept;
+        losses_.add(StoreError::NotJson, events.size() - *kept);
+    } else {
+        losses_.add(kept.error(), events.size());
+    }
+    losses_.report();
+    sinceCheck_ += events.size();
+    if (payloads_.capacity() > mostPayloadRoomKept)
+        payloads_ = std::string();
+}
+
+// Returns how many could be written as JSON.
+EventWriter::Expected<std::uint64_t> EventWriter::write(std::span<const AnalyticsEvent> events)
+{
+    std::uint64_t written = 0;
+    const auto writeAll = [&]() -> Expected<> {
+        if (const auto done = ensureOpen(); !done)
+            return done;
+        if (database_->logBytes() > maximumBytes() && !emptyLog())
+            return std::unexpected(StoreError::LogHeld);
+        if (const auto done = database_->begin(); !done)
+            return done;
+        while (!events.empty()) {
+            const std::size_t count = std::min(events.size(), EventDatabase::rowsAtOnce);
+            makeRows(events.first(count));
+            events = events.subspan(count);
+            written += rows_.size();
+            if (const auto done = database_->insert(rows_); !done)
+                return done;
+        }
+        return database_->commit();
+    };
+    const auto done = writeAll();
+    if (done)
+        return written;
+    handleFailure(done.error());
+    return std::unexpected(done.error());
+}
+
+// One payload often belongs to two events in a row, which are then the same object.
+void EventWriter::makeRows(std::span<const AnalyticsEvent> events)
+{
+    struct Extent {
+        std::size_t begin = 0;
+        std::size_t size = 0;
+    };
+    std::array<Extent, EventDatabase::rowsAtOnce> extents;
+    rows_.clear();
+    payloads_.clear();
+    const AnalyticsEvent* previous = nullptr;
+    for (const AnalyticsEvent& event : events) {
+        Extent& extent = extents[rows_.size()];
+        if (previous != nullptr && previous->payload.isSameObject(event.payload)) {
+            extent = extents[rows_.size() - 1];
+        } else {
+            const std::size_t begin = payloads_.size();
+            if (!foundation::appendJson(event.payload, payloads_))
+                continue;
+            extent = {begin, payloads_.size() - begin};
+        }
+        previous = &event;
+        rows_.push_back({event.time, event.name, {}});
+    }
+    for (std::size_t row = 0; row < rows_.size(); ++row) // now that the text does not move any more
+        rows_[row].payload = std::string_view(payloads_).substr(extents[row].begin, extents[row].size);
+}
+
+void EventWriter::handleFailure(StoreError error)
+{
+    if (database_)
+        database_->rollBack();
+    if (error == StoreError::DiskFull || error == StoreError::Locked || error == StoreError::LogHeld)
+        return; // the connection is as good as before
+    const bool wasOpen = database_ != nullptr;
+    database_.reset();
+    if (error == StoreError::Corrupt && wasOpen)
+        setAside(error); // where that fails, the next opening finds it damaged again
+}
+
+// --- Housekeeping
+
+bool EventWriter::maintain()
+{
+    losses_.report();
+    if (!database_)
+        return false;
+    const std::uint64_t logBytes = database_->logBytes();
+    if (logBytes < logBytesAtCheckpoint_)
+        logBytesAtCheckpoint_ = 0; // it began anew
+    if (logBytes - logBytesAtCheckpoint_ >= logBytesBetweenCheckpoints)
+        emptyLog();
+    const bool isDue = hasMoreToTidy_ || sinceCheck_ >= eventsBetweenChecks
+        || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
+    hasMoreToTidy_ = isDue && logBytes <= maximumBytes() && tidy(); // tidying makes the log longer
+    return hasMoreToTidy_;
+}
+
+bool EventWriter::emptyLog()
+{
+    const double now = clock_.systemUptime();
+    const bool waits = database_->logBytes() > maximumBytes() / 2 && now >= waitForReadersAt_;
+    if (waits)
+        waitForReadersAt_ = now + secondsBetweenWaits;
+    const bool isEmpty = database_->emptyLog(waits ? waitForReaders : std::chrono::milliseconds());
+    logBytesAtCheckpoint_ = database_->logBytes();
+    return isEmpty;
+}
+
+// Deletes more than came since the last time, so that it keeps up, but not everything at once. True when more is
+// left to do.
+bool EventWriter::tidy()
+{
+    const std::uint64_t most = 2 * sinceCheck_ + eventsDeletedAtOnce;
+    sinceCheck_ = 0;
+    checkedAt_ = clock_.systemUptime();
+    for (std::uint64_t done = 0; done < most;) {
+        const auto some = tidySome();
+        if (!some)
+            handleFailure(some.error());
+        if (!some || *some == 0)
+            return false;
+        done += *some;
+    }
+    return true;
+}
+
+// Returns how much it did, 0 when nothing is left to do.
+EventWriter::Expected<std::uint64_t> EventWriter::tidySome()
+{
+    const auto size = database_->size();
+    if (!size)
+        return std::unexpected(size.error());
+    const bool isTooLarge = size->usedBytes > maximumBytes();
+    const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
+    const auto deleted =
+        database_->deleteOldest(eventsDeletedAtOnce, isTooLarge ? std::numeric_limits<double>::infinity() : tooOld);
+    // New events fill what old ones left free; the file shrinks only where far too much is free.
+    const bool isFileTooLarge = size->usedBytes + size->freeBytes > maximumBytes() + maximumBytes() / 8;
+    if (deleted != 0 || !isFileTooLarge || size->freeBytes == 0)
+        return deleted;
+    if (const auto done = database_->shrink(bytesShrunkAtOnce); !done)
+        return std::unexpected(done.error());
+    return eventsDeletedAtOnce;
+}
+
+} // namespace platform

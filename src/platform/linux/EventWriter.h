@@ -1,0 +1,95 @@
+// Keeps events in the database, come what may: a damaged database is set aside and a new one begun, what cannot be
+// kept is counted and told, and what is too old or too much goes.
+#pragma once
+
+#include "foundation/Value.h"
+#include "platform/Clock.h"
+#include "platform/linux/AnalyticsConfiguration.h"
+#include "platform/linux/EventDatabase.h"
+#include "platform/linux/EventLosses.h"
+#include "platform/linux/ProviderLog.h"
+
+#include <atomic>
+#include <cstdint>
+#include <filesystem>
+#include <memory>
+#include <span>
+#include <string>
+#include <vector>
+
+namespace platform {
+
+struct AnalyticsEvent {
+    double time = 0; // seconds since 1970 UTC
+    std::string name;
+    foundation::Dictionary payload;
+};
+
+// One thread, but for the counts.
+class EventWriter {
+public:
+    static constexpr std::string_view fileName = "analytics.sqlite3";
+    static constexpr std::size_t mostDamagedKept = 3; // databases set aside; older ones are removed
+    static constexpr double secondsBetweenOpenings = 1; // of a database that could not be opened
+    // Of the write-ahead log: when it is moved to the database. What is moved at once holds up the next commit.
+    static constexpr std::uint64_t logBytesBetweenCheckpoints = 8 * 1024 * 1024;
+    // When a log that readers keep from beginning anew is longer than half its limit, the writer waits for them
+    // that long, and not again for a while. The limit is the same as the one of the database.
+    static constexpr std::chrono::milliseconds waitForReaders{200};
+    static constexpr double secondsBetweenWaits = 2;
+    // The bounds of age and size are looked after when so much was kept, or so much time went by.
+    static constexpr std::uint64_t eventsBetweenChecks = 4096;
+    static constexpr double secondsBetweenChecks = 60;
+    static constexpr std::uint64_t eventsDeletedAtOnce = 512;
+
+    EventWriter(const std::filesystem::path& directory, const Clock& clock, ProviderLog log);
+
+    void setConfiguration(const AnalyticsConfiguration& configuration);
+
+    // Opens the database, so that it is there before the first event.
+    void open();
+    // Keeps the events in one transaction; they are committed, or counted as lost, when this returns.
+    void keep(std::span<const AnalyticsEvent> events);
+    // Does some of the housekeeping that is due; true when more is left to do.
+    bool maintain();
+
+    // Any thread.
+    [[nodiscard]] std::uint64_t keptEvents() const noexcept { return kept_; }
+    [[nodiscard]] const EventLosses& losses() const noexcept { return losses_; }
+
+private:
+    template <typename Result = void> using Expected = EventDatabase::Expected<Result>;
+
+    [[nodiscard]] Expected<> ensureOpen();
+    [[nodiscard]] Expected<> openAnew();
+    bool setAside(StoreError reason);
+    void removeOldestDamaged();
+    [[nodiscard]] Expected<std::uint64_t> write(std::span<const AnalyticsEvent> events);
+    void makeRows(std::span<const AnalyticsEvent> events);
+    void handleFailure(StoreError error);
+    bool emptyLog();
+    [[nodiscard]] bool tidy();
+    [[nodiscard]] Expected<std::uint64_t> tidySome();
+    [[nodiscard]] std::uint64_t maximumBytes() const noexcept;
+
+    const std::filesystem::path path_;
+    const Clock& clock_;
+    const ProviderLog log_;
+    AnalyticsConfiguration configuration_;
+    EventLosses losses_;
+    std::atomic<std::uint64_t> kept_ = 0;
+
+    std::unique_ptr<EventDatabase> database_; // null: could not be opened
+    StoreError openError_ = StoreError::Other;
+    double openAgainAt_ = 0; // here and below: uptime, in seconds
+    std::uint64_t logBytesAtCheckpoint_ = 0;
+    double waitForReadersAt_ = 0;
+    double checkedAt_ = 0; // the bounds of age and size
+    std::uint64_t sinceCheck_ = 0; // events
+    bool hasMoreToTidy_ = true;
+
+    std::vector<EventRow> rows_;
+    std::string payloads_; // of `rows_`
+};
+
+} // namespace platform

@@ -1,0 +1,12 @@
+#include "platform/linux/LinuxDeviceProperties.h"
+
+namespace platform {
+
+std::optional<bool> LinuxDeviceProperties::boolean(std::string_view name) const
+{
+    const foundation::Dictionary values = file_.values();
+    const foundation::Value* value = values.find(name);
+    return value == nullptr ? std::nullopt : std::optional(value->asBoolean());
+}
+
+} // namespace platform
