@@ -1,0 +1,150 @@
+// Log statements: what is below the threshold costs nothing and evaluates nothing, what is above it says where it
+// stands.
+#include "platform/Log.h"
+
+#include "support/TestPlatform.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <string>
+#include <thread>
+#include <vector>
+
+namespace platform {
+namespace {
+
+using support::IsLine;
+using testing::ElementsAre;
+
+constexpr std::string_view subsystem = "com.quarn.kesto.reporting";
+
+class LogTest : public testing::Test {
+protected:
+    // As at the start of another service in the same process.
+    static void installAnew()
+    {
+        const Platform same = current();
+        install(same);
+    }
+
+    support::TestPlatform platform_;
+    LogCategory category_{subsystem, "test"};
+};
+
+TEST_F(LogTest, ALineCarriesItsLevelTagAndText)
+{
+    KESTO_LOG(category_, Error, "session {} of \"{}\" is gone", 42, std::string("player"));
+    KESTO_LOG(category_, Debug, "plain");
+    EXPECT_THAT(platform_.log.take(),
+                ElementsAre(IsLine(LogLevel::Error, "test", "session 42 of \"player\" is gone"),
+                            IsLine(LogLevel::Debug, "test", "plain")));
+}
+
+TEST_F(LogTest, ALineSaysWhereItStands)
+{
+    KESTO_LOG(category_, Info, "here");
+    const int line = __LINE__ - 1;
+    const auto lines = platform_.log.take();
+    ASSERT_EQ(lines.size(), 1U);
+    EXPECT_EQ(lines[0].file, "LogTest");
+    EXPECT_EQ(lines[0].line, line);
+    EXPECT_EQ(lines[0].subsystem, subsystem);
+}
+
+TEST_F(LogTest, EveryThresholdLetsThroughItselfAndWhatIsMoreImportant)
+{
+    const std::vector<LogLevel> levels{LogLevel::Error, LogLevel::Default, LogLevel::Info, LogLevel::Debug};
+    for (const LogLevel threshold : levels) {
+        platform_.log.setThreshold(threshold);
+        installAnew();
+        for (const LogLevel level : levels)
+            EXPECT_EQ(category_.isEnabled(level), level <= threshold) << name(level) << " at " << name(threshold);
+    }
+}
+
+TEST_F(LogTest, WhatIsNotSaidIsNotEvaluated)
+{
+    platform_.log.setThreshold(LogLevel::Default);
+    int evaluated = 0;
+    KESTO_LOG(category_, Info, "{}", ++evaluated);
+    KESTO_LOG(category_, Debug, "{}", ++evaluated);
+    EXPECT_EQ(evaluated, 0);
+    KESTO_LOG(category_, Default, "{}", ++evaluated);
+    EXPECT_EQ(evaluated, 1);
+    EXPECT_THAT(platform_.log.take(), ElementsAre(IsLine(LogLevel::Default, "test", "1")));
+}
+
+TEST_F(LogTest, TheThresholdIsAskedForOnceACategory)
+{
+    platform_.log.setThreshold(LogLevel::Info);
+    KESTO_LOG(category_, Debug, "dropped");
+    platform_.log.setThreshold(LogLevel::Debug);
+    KESTO_LOG(category_, Debug, "dropped all the same");
+    LogCategory newcomer(subsystem, "newcomer");
+    KESTO_LOG(newcomer, Debug, "kept");
+    EXPECT_THAT(platform_.log.take(), ElementsAre(IsLine(LogLevel::Debug, "newcomer", "kept")));
+}
+
+TEST_F(LogTest, ANewInstallationIsAskedAnew)
+{
+    platform_.log.setThreshold(LogLevel::Error);
+    KESTO_LOG(category_, Info, "dropped");
+    platform_.log.setThreshold(LogLevel::Info);
+    installAnew();
+    KESTO_LOG(category_, Info, "kept");
+    EXPECT_THAT(platform_.log.take(), ElementsAre(IsLine(LogLevel::Info, "test", "kept")));
+}
+
+TEST_F(LogTest, ThreadsMayMeetACategoryForTheFirstTimeTogether)
+{
+    {
+        std::vector<std::jthread> threads;
+        for (int thread = 0; thread < 4; ++thread)
+            threads.emplace_back([this] { KESTO_LOG(category_, Info, "from a thread"); });
+    }
+    EXPECT_EQ(platform_.log.take().size(), 4U);
+}
+
+// What an installation leaves behind must not be asked for a threshold, nor its absence remembered as one.
+TEST(LogWithoutPlatform, DropsStatementsAndRemembersNothing)
+{
+    LogCategory category(subsystem, "early");
+    KESTO_LOG(category, Error, "nobody listens");
+    {
+        support::TestPlatform platform;
+        KESTO_LOG(category, Debug, "heard");
+        EXPECT_THAT(platform.log.take(), ElementsAre(IsLine(LogLevel::Debug, "early", "heard")));
+    }
+    KESTO_LOG(category, Error, "nobody listens again");
+    EXPECT_FALSE(category.isEnabled(LogLevel::Error));
+}
+
+TEST(LogPrefix, HasTheFileRightAlignedAndTheLineLeftAligned)
+{
+    EXPECT_EQ(logPrefix({"KestoReportingSession", 7}), "    KestoReportingSession:7     ");
+    EXPECT_EQ(logPrefix({"Log", 12345}), "                      Log:12345 ");
+}
+
+TEST(LogPrefix, LongNamesAreNotCut)
+{
+    EXPECT_EQ(logPrefix({"KestoReportingServiceDelegate", 123456}), "KestoReportingServiceDelegate:123456 ");
+}
+
+TEST(LogLocation, IsTheFileWithoutFoldersAndExtension)
+{
+    static_assert(baseName("/a/b/Name.cpp") == "Name");
+    static_assert(baseName("Name.cpp") == "Name");
+    static_assert(baseName("/a.d/Name") == "Name");
+    static_assert(baseName("src/Two.Dots.cpp") == "Two.Dots");
+}
+
+TEST(LogLevel, HasAName)
+{
+    EXPECT_EQ(name(LogLevel::Error), "error");
+    EXPECT_EQ(name(LogLevel::Default), "default");
+    EXPECT_EQ(name(LogLevel::Info), "info");
+    EXPECT_EQ(name(LogLevel::Debug), "debug");
+}
+
+} // namespace
+} // namespace platform
