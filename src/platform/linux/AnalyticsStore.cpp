@@ -1,5 +1,6 @@
 #include "platform/linux/AnalyticsStore.h"
 
+#include "platform/linux/SerialQueue.h"
 #include "platform/linux/Thread.h"
 
 #include <future>
@@ -113,7 +114,7 @@ void AnalyticsStore::sendAnalyticsEventLazy(std::string eventName, PayloadBuilde
 {
     AnalyticsEvent event{clock_.secondsSince1970(), std::move(eventName), payloadBuilder()};
     const foundation::Lock lock(lock_);
-    if (std::this_thread::get_id() == turnThread_) {
+    if (SerialQueue::isTurnRunning()) {
         turn_.add(std::move(event));
         if (isRoomIn(turn_))
             return;
@@ -129,7 +130,6 @@ void AnalyticsStore::endTurn(WhenKept whenKept)
 {
     {
         const foundation::Lock lock(lock_);
-        turnThread_ = std::this_thread::get_id();
         if (!isEverythingKept()) {
             waiting_.takeFrom(turn_);
             if (whenKept)

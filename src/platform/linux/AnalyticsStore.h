@@ -49,15 +49,14 @@ public:
     ~AnalyticsStore() override;
 
     [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override { return names_.contains(eventName); }
-    // Stamps the event with the time and builds its payload at once. An event sent on the thread that ends turns
-    // is written when its turn has ended, one sent on another thread soon. Blocks only while too much waits to
-    // be written.
+    // Stamps the event with the time and builds its payload at once. An event that a turn sends is written when the
+    // turn has ended, any other at once. Blocks only while too much waits to be written.
     void sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder) override;
 
-    // Ends the turn of the calling thread, which is always the same. `whenKept`, unless it is empty, is called once
-    // everything sent so far is committed, or counted as lost: here and now when it is, on the store's thread
-    // otherwise, one after the other in the order of the turns. It must not use the store. Blocks only while
-    // too much waits to be written.
+    // Ends the turn that the calling thread runs. `whenKept`, unless it is empty, is called once everything sent so
+    // far is committed, or counted as lost: here and now when it is, on the store's thread otherwise, one after
+    // the other in the order of the turns. It must not use the store. Blocks only while too much waits to be
+    // written.
     void endTurn(WhenKept whenKept);
 
     // Returns when everything sent so far is committed, or counted as lost.
@@ -103,7 +102,6 @@ private:
     foundation::Condition room_; // what waited is being written
     Batch turn_ KESTO_GUARDED_BY(lock_); // of the turn that has not ended
     Batch waiting_ KESTO_GUARDED_BY(lock_);
-    std::thread::id turnThread_ KESTO_GUARDED_BY(lock_);
     std::optional<AnalyticsConfiguration> newConfiguration_ KESTO_GUARDED_BY(lock_);
     bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until those who wait have been told
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // so that only who finds the thread asleep pays for waking it
