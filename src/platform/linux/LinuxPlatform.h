@@ -1,0 +1,54 @@
+// All providers of this system, made in the order in which they need each other.
+//
+//     auto launch = platform::LaunchConfiguration::fromEnvironment();
+//     if (!launch)
+//         ... print launch.error(), exit with LaunchConfiguration::exitStatus
+//     platform::LinuxPlatform providers(*launch);
+//     platform::install(providers.platform());
+#pragma once
+
+#include "platform/Absent.h"
+#include "platform/Platform.h"
+#include "platform/linux/AnalyticsStore.h"
+#include "platform/linux/ConfigurationWatcher.h"
+#include "platform/linux/LaunchConfiguration.h"
+#include "platform/linux/LinuxClock.h"
+#include "platform/linux/LinuxDeviceProperties.h"
+#include "platform/linux/LinuxFeatureFlags.h"
+#include "platform/linux/LinuxFileSystem.h"
+#include "platform/linux/LinuxLog.h"
+#include "platform/linux/LinuxPreferences.h"
+#include "platform/linux/LinuxProcessTable.h"
+#include "platform/linux/LinuxWorkQueues.h"
+
+namespace platform {
+
+// One a process, for as long as it lives: its queues run until the very end.
+class LinuxPlatform {
+public:
+    explicit LinuxPlatform(const LaunchConfiguration& launch);
+
+    [[nodiscard]] Platform platform();
+    // What the bundle does not show: how many events were kept and lost, and a way to write all that were sent.
+    [[nodiscard]] AnalyticsStore& analyticsStore() noexcept { return analytics_; }
+
+private:
+    LinuxLog log_;
+    ConfigurationWatcher configurationWatcher_;
+    LinuxClock clock_;
+    LinuxPreferences preferences_;
+    LinuxFeatureFlags featureFlags_;
+    LinuxDeviceProperties deviceProperties_;
+    LinuxProcessTable processTable_;
+    LinuxFileSystem fileSystem_;
+    AbsentNotifications notifications_;
+    AbsentTraceMarkers traceMarkers_;
+    AbsentReportingChannels reportingChannels_;
+    AbsentBugCapture bugCapture_;
+    AbsentKernelTrace kernelTrace_;
+    AbsentPerformanceWriter performanceWriter_;
+    AnalyticsStore analytics_;
+    LinuxWorkQueues workQueues_; // ends first, for its turns end in the store
+};
+
+} // namespace platform
