@@ -7,6 +7,7 @@
 #include <array>
 #include <fmt/format.h>
 #include <limits>
+#include <utility>
 
 namespace {
 
@@ -210,10 +211,12 @@ std::expected<void, Connection::Violation> KestoReportingServiceProtocolAdapter:
     const auto callNumber = values[0].number() ? values[0].number()->exactly<std::uint64_t>() : std::nullopt;
     if (!callNumber)
         return violation("a call's number is an unsigned 64-bit integer");
-    const auto methodNumber = values[1].number() ? values[1].number()->exactly<std::size_t>() : std::nullopt;
-    if (!methodNumber || *methodNumber < 1 || *methodNumber > methods.size())
-        return violation(fmt::format("unknown method {}; there are 1 to {}", values[1].text(), methods.size()));
-    const Method& method = methods[*methodNumber - 1];
+    const auto methodNumber = values[1].number() ? values[1].number()->exactly<std::int64_t>() : std::nullopt;
+    if (!methodNumber) // not repeated to the log, where it could fill a disk or forge lines
+        return violation(fmt::format("a call's method is an integer from 1 to {}", methods.size()));
+    if (*methodNumber < 1 || std::cmp_greater(*methodNumber, methods.size()))
+        return violation(fmt::format("unknown method {}; there are 1 to {}", *methodNumber, methods.size()));
+    const Method& method = methods[static_cast<std::size_t>(*methodNumber) - 1];
     if (values.size() - headCount != method.argumentCount)
         return violation(
             fmt::format("{} takes {} arguments, not {}", method.name, method.argumentCount, values.size() - headCount));

@@ -1,5 +1,6 @@
 // How the drivers' channels changed over a session, put into words: one entry a channel, in a dictionary for
 // each kind of channel.
+#define KESTO_LOG_FILE "KestoReportingDriverUtility"
 #include "driver/KestoReportingDriverUtility.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"

@@ -97,12 +97,18 @@ consteval std::string_view baseName(std::string_view path)
 
 } // namespace platform
 
+// The file that log lines name. A file that continues a class in the way of another one names that other one,
+// defined before anything is included: readers of the log know classes, not how their code is cut.
+#ifndef KESTO_LOG_FILE
+#define KESTO_LOG_FILE __FILE__
+#endif
+
 // KESTO_LOG(category, level, "format of {fmt}", arguments...)
 #define KESTO_LOG(logCategory, logLevel, ...)                                                                \
     do {                                                                                                     \
         ::platform::LogCategory& kestoLogCategory = (logCategory);                                           \
         if (kestoLogCategory.isEnabled(::platform::LogLevel::logLevel)) [[unlikely]] {                       \
-            constexpr std::string_view kestoLogFile = ::platform::baseName(__FILE__);                        \
+            constexpr std::string_view kestoLogFile = ::platform::baseName(KESTO_LOG_FILE);                  \
             ::platform::writeLog(kestoLogCategory, ::platform::LogLevel::logLevel, {kestoLogFile, __LINE__}, \
                                  __VA_ARGS__);                                                               \
         }                                                                                                    \

@@ -93,22 +93,24 @@ std::uint32_t KestoReportingMessageStore::kindOf(AudioEventCategory category, Au
 
 bool KestoReportingMessageStore::append(Head head, const foundation::Dictionary& payload, Payload& appended)
 {
-    scratch_.clear();
-    if (const std::size_t size = textSize(payload); size > largestEncoded) {
-        if (!pay(size))
-            return false;
-        head.size = keptAside;
-    } else {
-        foundation::appendCbor(payload, scratch_);
-        head.size = static_cast<std::uint32_t>(scratch_.size());
-    }
-    char* place = allocate(sizeof head + scratch_.size());
-    if (place == nullptr)
+    const std::size_t size = textSize(payload);
+    const bool isLarge = size > largestEncoded;
+    if (isLarge && !pay(size))
         return false;
+    scratch_.clear();
+    if (!isLarge)
+        foundation::appendCbor(payload, scratch_);
+    head.size = isLarge ? keptAside : static_cast<std::uint32_t>(scratch_.size());
+    char* place = allocate(sizeof head + scratch_.size());
+    if (place == nullptr) {
+        if (isLarge)
+            refund(size);
+        return false;
+    }
     std::memcpy(place, &head, sizeof head);
     std::memcpy(place + sizeof head, scratch_.data(), scratch_.size());
     appended.encoded_ = {place + sizeof head, scratch_.size()};
-    appended.kept_ = head.size == keptAside ? &large_.emplace_back(payload) : nullptr;
+    appended.kept_ = isLarge ? &large_.emplace_back(payload) : nullptr;
     return true;
 }
 
@@ -119,6 +121,12 @@ bool KestoReportingMessageStore::pay(std::size_t bytes)
         return false;
     paid_ += bytes;
     return true;
+}
+
+void KestoReportingMessageStore::refund(std::size_t bytes)
+{
+    budget_->giveBack(bytes);
+    paid_ -= bytes;
 }
 
 // Room for so many bytes, or null pointer when the budget has no more.

@@ -106,6 +106,7 @@ private:
     [[nodiscard]] static bool repeatsLast(const Kind& kind, const foundation::Dictionary& payload);
     [[nodiscard]] bool append(Head head, const foundation::Dictionary& payload, Payload& appended);
     [[nodiscard]] bool pay(std::size_t bytes);
+    void refund(std::size_t bytes);
     [[nodiscard]] char* allocate(std::size_t bytes);
     static Head headAt(const char* place);
 

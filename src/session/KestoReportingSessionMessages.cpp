@@ -1,4 +1,5 @@
 // Receiving a message: it is normalised, compared with the one before of its kind, and recorded.
+#define KESTO_LOG_FILE "KestoReportingSession"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
 #include "utility/KestoReportingTraceCodes.h"

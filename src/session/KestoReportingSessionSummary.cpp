@@ -1,5 +1,6 @@
 // The session's summary: every value that each key took, in one event, and on internal builds the whole message
 // store as a file that diagnostic tools read.
+#define KESTO_LOG_FILE "KestoReportingSession"
 #include "foundation/LocalTime.h"
 #include "foundation/PrettyJsonWriter.h"
 #include "platform/Platform.h"

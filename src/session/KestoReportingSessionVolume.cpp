@@ -2,6 +2,7 @@
 // which output ran in one and the same way becomes a volume event.
 //
 // Switches arrive in bursts; a burst is folded into one payload first, at the place of its first message.
+#define KESTO_LOG_FILE "KestoReportingSession"
 #include "session/KestoReportingRapidMessages.h"
 #include "session/KestoReportingSession.h"
 #include "session/KestoReportingVolumeFields.h"
