@@ -33,7 +33,7 @@ void FrameReader::feed(std::string_view bytes) noexcept
 std::expected<std::optional<std::string_view>, FrameError> FrameReader::next()
 {
     if (cutOffIsDone_) {
-        cutOff_ = std::string(); // rather than clear: an idle stream keeps no buffer
+        std::string().swap(cutOff_); // rather than clear: an idle stream keeps no buffer
         cutOffIsDone_ = false;
     }
     if (!cutOff_.empty())

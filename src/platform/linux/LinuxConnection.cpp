@@ -240,7 +240,7 @@ void LinuxConnection::writeOutput()
         dropOutput();
     }
     if (outputStart_ == output_.size()) {
-        output_ = std::string(); // rather than clear: an idle connection keeps no buffer
+        std::string().swap(output_); // rather than clear: an idle connection keeps no buffer
         outputStart_ = 0;
     } else if (outputStart_ > output_.size() / 2) { // so that moving costs less than sending did
         output_.erase(0, outputStart_);
@@ -252,7 +252,7 @@ void LinuxConnection::writeOutput()
 void LinuxConnection::dropOutput()
 {
     drop(output_.size() - outputStart_);
-    output_ = std::string();
+    std::string().swap(output_);
     outputStart_ = 0;
 }
 

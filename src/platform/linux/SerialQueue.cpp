@@ -20,18 +20,15 @@ public:
     void add(WorkItem item)
     {
         const bool mayHelp = isInteractive_ && thisThread.mayHelp(this);
-        bool wake = false;
-        {
-            const foundation::Lock lock(lock_);
-            waiting_.push_back(std::move(item));
-            const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith;
-            wake = isAsleep_ && !isTurnTaken_ && !isLeftToHelper;
-            isAsleep_ &= !wake;
-        }
         if (mayHelp)
             thisThread.toHelp = shared_from_this();
-        if (wake) // not under the lock, which the woken thread wants first of all
-            changed_.notifyOne();
+        const foundation::Lock lock(lock_);
+        waiting_.push_back(std::move(item));
+        const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith;
+        if (isAsleep_ && !isTurnTaken_ && !isLeftToHelper) {
+            isAsleep_ = false;
+            changed_.notifyOne(); // under the lock: once it is released, the item may do away with the queue
+        }
     }
 
     // Nothing is added any more, except by items.
@@ -49,12 +46,12 @@ public:
             runTurn();
     }
 
-    // Runs one turn on another thread, unless the queue's thread is up and sees to it.
+    // Runs one turn on another thread, unless the queue's thread sees to it.
     void help()
     {
         {
             const foundation::Lock lock(lock_);
-            if (!isAsleep_ || isTurnTaken_ || waiting_.empty())
+            if (isTurnTaken_ || waiting_.empty() || waiting_.size() > mostItemsHelpedWith)
                 return;
             takeTurn();
         }
