@@ -18,6 +18,7 @@ namespace fs = std::filesystem;
 // A file counts as changed when who wrote it closes it, not with every piece that is written.
 constexpr std::uint32_t changesOfFiles =
     IN_CLOSE_WRITE | IN_CREATE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_ATTRIB;
+constexpr std::uint32_t writesOfFiles = IN_CLOSE_WRITE | IN_MOVED_TO;
 constexpr std::uint32_t endsOfDirectories = IN_DELETE_SELF | IN_MOVE_SELF;
 
 bool isThere(const fs::path& directory)
@@ -44,10 +45,11 @@ ConfigurationWatcher::~ConfigurationWatcher()
     thread_.join();
 }
 
-std::unique_ptr<ConfigurationWatcher::Watch> ConfigurationWatcher::watch(const fs::path& subdirectory, Handler handler)
+std::unique_ptr<ConfigurationWatcher::Watch> ConfigurationWatcher::watch(const fs::path& subdirectory, Handler handler,
+                                                                         Changes changes)
 {
     const fs::path directory = subdirectory.empty() ? root_ : root_ / subdirectory;
-    std::unique_ptr<Watch> watch(new Watch(*this, directory, std::move(handler)));
+    std::unique_ptr<Watch> watch(new Watch(*this, directory, changes, std::move(handler)));
     const foundation::Lock lock(lock_);
     watches_.push_back(watch.get());
     start();
@@ -145,18 +147,18 @@ void ConfigurationWatcher::handleEvents()
                  || place->second.awaited.contains(fileName))
             structureChanged = true;
         else if (place->second.isWanted && !fileName.empty())
-            tell(&place->second.directory, fileName);
+            tell(&place->second.directory, fileName, (event.mask & writesOfFiles) != 0);
     }
     if (structureChanged) {
         arm();
-        tell(nullptr, {});
+        tell(nullptr, {}, true);
     }
 }
 
-void ConfigurationWatcher::tell(const fs::path* directory, std::string_view fileName)
+void ConfigurationWatcher::tell(const fs::path* directory, std::string_view fileName, bool isWrite)
 {
     for (const Watch* watch : watches_)
-        if (directory == nullptr || watch->directory_ == *directory)
+        if ((directory == nullptr || watch->directory_ == *directory) && (isWrite || watch->changes_ == Changes::All))
             watch->handler_(fileName);
 }
 

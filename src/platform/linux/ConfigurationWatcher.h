@@ -28,6 +28,12 @@ public:
     // any of them may have.
     using Handler = std::function<void(std::string_view fileName)>;
 
+    // Which changes of files somebody wants to know.
+    enum class Changes : std::uint8_t {
+        All,
+        Writes // that a file was written to its end, or put in place; also when it holds what it held before
+    };
+
     // What somebody watches; it ends with this object, which waits for a handler that is running.
     class Watch {
     public:
@@ -37,14 +43,16 @@ public:
 
     private:
         friend class ConfigurationWatcher;
-        Watch(ConfigurationWatcher& watcher, std::filesystem::path directory, Handler handler)
+        Watch(ConfigurationWatcher& watcher, std::filesystem::path directory, Changes changes, Handler handler)
             : watcher_(watcher),
               directory_(std::move(directory)),
+              changes_(changes),
               handler_(std::move(handler))
         {
         }
         ConfigurationWatcher& watcher_;
         const std::filesystem::path directory_;
+        const Changes changes_;
         const Handler handler_;
     };
 
@@ -57,10 +65,11 @@ public:
 
     [[nodiscard]] const std::filesystem::path& root() const noexcept { return root_; }
 
-    // Watches the files of the root, or of a directory in it. From the moment this returns, no change is missed:
-    // watch first, then read. Where the kernel refuses to watch, one line of the log says so and changes take
-    // effect at the next start.
-    [[nodiscard]] std::unique_ptr<Watch> watch(const std::filesystem::path& subdirectory, Handler handler);
+    // Watches the files of the root, of a directory in it, or of any other given by its absolute path. From the moment
+    // this returns, no change is missed: watch first, then read. Where the kernel refuses to watch, one line of the log
+    // says so and changes take effect at the next start.
+    [[nodiscard]] std::unique_ptr<Watch> watch(const std::filesystem::path& subdirectory, Handler handler,
+                                               Changes changes = Changes::All);
 
 private:
     // What an inotify watch is there for.
@@ -77,7 +86,7 @@ private:
     Place* add(std::filesystem::path& directory, std::string& missing) KESTO_REQUIRES(lock_);
     void run();
     void handleEvents();
-    void tell(const std::filesystem::path* directory, std::string_view fileName) KESTO_REQUIRES(lock_);
+    void tell(const std::filesystem::path* directory, std::string_view fileName, bool isWrite) KESTO_REQUIRES(lock_);
     void complain(std::string_view what, int systemError);
 
     const std::filesystem::path root_;

@@ -3,6 +3,25 @@
 #include "platform/linux/Outbox.h"
 
 namespace platform {
+namespace {
+
+// By which notification the owner of a preferences domain tells that it changed; empty for domains that tell
+// nothing.
+std::string_view notificationOf(std::string_view domain)
+{
+    if (domain == "com.quarn.kesto")
+        return "com.quarn.kesto.reporting";
+    if (domain == "com.quarn.halden")
+        return "com.quarn.halden.spatial-audio-accessory-feature.changed";
+    return {};
+}
+
+std::filesystem::path notificationsDirectory(const LaunchConfiguration& launch)
+{
+    return launch.runtimeDirectory.empty() ? std::filesystem::path() : launch.runtimeDirectory / "notifications";
+}
+
+} // namespace
 
 LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
     : log_(launch.logThresholds, LinuxLog::destinationOfThisProcess()),
@@ -11,8 +30,13 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       featureFlags_(configurationWatcher_, ProviderLog(log_)),
       deviceProperties_(configurationWatcher_, ProviderLog(log_)),
       fileSystem_(launch.logsDirectory),
+      notifications_(notificationsDirectory(launch), configurationWatcher_, ProviderLog(log_)),
       analytics_(launch.stateDirectory, configurationWatcher_, clock_, ProviderLog(log_))
 {
+    preferences_.setChangeHandler([this](std::string_view domain) {
+        if (const auto name = notificationOf(domain); !name.empty())
+            notifications_.post(name);
+    });
     // The replies of a turn leave once its events are kept.
     workQueues_.setTurnEndHandler([this] { analytics_.endTurn(Outbox::endTurn()); });
 }

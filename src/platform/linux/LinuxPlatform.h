@@ -17,6 +17,7 @@
 #include "platform/linux/LinuxFeatureFlags.h"
 #include "platform/linux/LinuxFileSystem.h"
 #include "platform/linux/LinuxLog.h"
+#include "platform/linux/LinuxNotifications.h"
 #include "platform/linux/LinuxPreferences.h"
 #include "platform/linux/LinuxProcessTable.h"
 #include "platform/linux/LinuxWorkQueues.h"
@@ -41,7 +42,7 @@ private:
     LinuxDeviceProperties deviceProperties_;
     LinuxProcessTable processTable_;
     LinuxFileSystem fileSystem_;
-    AbsentNotifications notifications_;
+    LinuxNotifications notifications_;
     AbsentTraceMarkers traceMarkers_;
     AbsentReportingChannels reportingChannels_;
     AbsentBugCapture bugCapture_;
