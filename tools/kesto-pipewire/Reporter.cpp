@@ -1,0 +1,333 @@
+#include "kesto-pipewire/Reporter.h"
+
+#include <algorithm>
+#include <cmath>
+#include <limits>
+#include <tuple>
+#include <utility>
+
+namespace kesto_pipewire {
+
+namespace {
+
+constexpr std::string_view noDevice = "none";
+constexpr auto infinity = std::numeric_limits<double>::infinity();
+
+double roundedToMilliseconds(double seconds)
+{
+    return std::round(seconds * 1000) / 1000;
+}
+
+Moment later(Moment left, Moment right)
+{
+    return left.uptime < right.uptime ? right : left;
+}
+
+std::string devicesText(const std::string& devices)
+{
+    return std::string(devices.empty() ? noDevice : devices);
+}
+
+void append(Payload& payload, const std::optional<StreamFormat>& format)
+{
+    if (!format)
+        return;
+    payload.emplace_back("session_selected_format", format->text);
+    if (format->channels > 0)
+        payload.emplace_back("mChannelsPerFrame", std::int64_t{format->channels});
+}
+
+} // namespace
+
+ServiceType serviceTypeOfRole(std::string_view role)
+{
+    constexpr std::pair<std::string_view, ServiceType> types[] = {
+        {"Phone", ServiceType::Telephony},
+        {"Communication", ServiceType::Telephony},
+        {"Notification", ServiceType::Alerts},
+        {"Alarm", ServiceType::Alarms},
+        {"Music", ServiceType::LongFormAudio},
+        {"Movie", ServiceType::LongFormAudio},
+        {"Game", ServiceType::NonLongFormAudio},
+        {"Event", ServiceType::SystemSounds},
+        {"Test", ServiceType::Test},
+    };
+    const auto* found = std::ranges::find(types, role, &std::pair<std::string_view, ServiceType>::first);
+    return found == std::end(types) ? ServiceType::Generic : found->second;
+}
+
+bool Reporter::Stream::isKnownWhole() const
+{
+    return volume.current && format.current && !devices.current.empty();
+}
+
+Category Reporter::Stream::category() const
+{
+    return description.direction == Direction::Output ? Category::Playback : Category::Record;
+}
+
+Reporter::Reporter(ReportingService& service, ReporterID firstID, Alarm alarm)
+    : service_(service),
+      alarm_(std::move(alarm)),
+      nextID_(firstID)
+{
+}
+
+// Hearing of streams.
+
+template <typename Action> void Reporter::update(StreamSerial serial, Moment when, Action action)
+{
+    const auto found = streams_.find(serial);
+    if (found == streams_.end())
+        return;
+    action(found->second);
+    tellDue(found->second, when);
+    setAlarm();
+}
+
+void Reporter::appeared(StreamSerial serial, const StreamDescription& description, Moment when)
+{
+    Stream stream;
+    stream.session = nextID_++;
+    stream.description = description;
+    stream.appearedAt = when;
+    if (serviceIsThere_)
+        openSession(stream);
+    streams_.insert_or_assign(serial, std::move(stream));
+}
+
+void Reporter::runningChanged(StreamSerial serial, bool running, Moment when)
+{
+    update(serial, when, [&](Stream& stream) {
+        if (!running && stream.running.current && !stream.running.told)
+            tellChanges(stream, infinity); // it did run, however short
+        stream.running.observe(running, when);
+    });
+}
+
+void Reporter::volumeChanged(StreamSerial serial, double volume, Moment when)
+{
+    update(serial, when, [&](Stream& stream) { stream.volume.observe(volume, when); });
+}
+
+void Reporter::formatChanged(StreamSerial serial, const StreamFormat& format, Moment when)
+{
+    update(serial, when, [&](Stream& stream) { stream.format.observe(format, when); });
+}
+
+void Reporter::devicesChanged(StreamSerial serial, const std::string& devices, Moment when)
+{
+    update(serial, when, [&](Stream& stream) { stream.devices.observe(devices, when); });
+}
+
+void Reporter::cycleWasLate(StreamSerial serial, Moment when)
+{
+    update(serial, when, [&](Stream& stream) {
+        if (!stream.running.told || when.uptime < stream.running.toldSince.uptime + startUpTime)
+            return;
+        if (!stream.episode)
+            stream.episode = Episode{when, when, 0};
+        stream.episode->last = when;
+        ++stream.episode->cycles;
+    });
+}
+
+void Reporter::gone(StreamSerial serial, Moment when)
+{
+    update(serial, when, [&](Stream& stream) {
+        tellChanges(stream, infinity);
+        stream.running.observe(false, when);
+        tellChanges(stream, infinity);
+        closeSession(stream, when);
+    });
+    streams_.erase(serial);
+    setAlarm();
+}
+
+// Deciding what is due.
+
+Reporter::Changes Reporter::changesOf(const Stream& stream)
+{
+    Changes changes;
+    const auto add = [&changes](const auto& fact, auto tell, Moment when, double due) {
+        if (!fact.isPending())
+            return;
+        const auto place =
+            std::ranges::upper_bound(changes, when.uptime, {}, [](const Change& change) { return change.when.uptime; });
+        changes.insert(place, {tell, when, std::min(due, fact.pendingSince.uptime + longestHold)});
+    };
+    const auto& [running, volume, format, devices] =
+        std::tie(stream.running, stream.volume, stream.format, stream.devices);
+    const auto startsAtOnce = running.current && (stream.runs > 0 || stream.isKnownWhole());
+    add(running, &Reporter::tellRunning, running.changedAt,
+        running.changedAt.uptime + (startsAtOnce ? 0 : settlingTime));
+    if (stream.runs == 0)
+        return changes; // the first start will tell the rest
+
+    // A stream whose device goes stops for it, a moment later; but what it stopped on is that device.
+    const auto stopsForIt = devices.current.empty() && running.isPending() && !running.current;
+    const auto moved = stopsForIt ? later(devices.changedAt, running.changedAt) : devices.changedAt;
+    add(volume, &Reporter::tellVolume, volume.changedAt,
+        std::max(volume.changedAt.uptime, volume.toldSince.uptime + volumeInterval));
+    add(format, &Reporter::tellFormat, format.changedAt, format.changedAt.uptime + settlingTime);
+    add(devices, &Reporter::tellDevices, moved, moved.uptime + settlingTime);
+    return changes;
+}
+
+std::optional<double> Reporter::changesDue(const Stream& stream)
+{
+    const auto changes = changesOf(stream);
+    return changes.empty() ? std::nullopt : std::optional(changes.front().due); // the others wait for their turn
+}
+
+std::optional<double> Reporter::episodeDue(const Stream& stream)
+{
+    if (!stream.episode)
+        return std::nullopt;
+    return std::min(stream.episode->last.uptime + quietTime, stream.episode->first.uptime + longestEpisode);
+}
+
+void Reporter::tellDue(Stream& stream, Moment now)
+{
+    if (episodeDue(stream).value_or(infinity) <= now.uptime)
+        tellEpisode(stream);
+    tellChanges(stream, now.uptime);
+}
+
+void Reporter::settle(Moment now)
+{
+    for (auto& [serial, stream] : streams_)
+        tellDue(stream, now);
+    alarmTime_.reset(); // it has gone off
+    setAlarm();
+}
+
+void Reporter::setAlarm()
+{
+    auto earliest = infinity;
+    for (const auto& [serial, stream] : streams_)
+        earliest = std::min({earliest, changesDue(stream).value_or(infinity), episodeDue(stream).value_or(infinity)});
+    const auto time = earliest == infinity ? std::nullopt : std::optional(earliest);
+    if (std::exchange(alarmTime_, time) != time)
+        alarm_(time);
+}
+
+// Telling it.
+
+void Reporter::tellChanges(Stream& stream, double dueUntil)
+{
+    for (const auto& change : changesOf(stream)) {
+        if (change.due > dueUntil)
+            return;
+        (this->*change.tell)(stream, change.when);
+    }
+}
+
+void Reporter::tellRunning(Stream& stream, Moment when)
+{
+    tellEpisode(stream);
+    stream.running.tell();
+    if (stream.running.told && ++stream.runs == 1) {
+        stream.volume.tell();
+        stream.format.tell();
+        stream.devices.tell();
+    }
+    sendRunning(stream, when);
+}
+
+void Reporter::tellVolume(Stream& stream, Moment when)
+{
+    stream.volume.tell();
+    send(stream, Category::Volume, EventType::State, {{"PomoSessionVolume", *stream.volume.told}}, when);
+}
+
+void Reporter::tellFormat(Stream& stream, Moment when)
+{
+    stream.format.tell();
+    Payload message;
+    append(message, stream.format.told);
+    send(stream, Category::Setup, EventType::State, std::move(message), when);
+}
+
+void Reporter::tellDevices(Stream& stream, Moment when)
+{
+    stream.devices.tell();
+    send(stream, Category::RouteChange, EventType::State, {{"active_devices", devicesText(stream.devices.told)}}, when);
+}
+
+void Reporter::tellEpisode(Stream& stream)
+{
+    const auto episode = std::exchange(stream.episode, std::nullopt);
+    if (!episode)
+        return;
+    send(stream, Category::Error, EventType::IssueDetector,
+         {{"issue", "late_cycles"},
+          {"late_cycles", episode->cycles},
+          {"issue_duration", roundedToMilliseconds(episode->last.uptime - episode->first.uptime)},
+          {"active_devices", devicesText(stream.devices.told)}},
+         episode->last);
+}
+
+void Reporter::sendRunning(const Stream& stream, Moment when)
+{
+    const auto isOutput = stream.description.direction == Direction::Output;
+    Payload message{{isOutput ? "session_output_running" : "session_input_running", stream.running.told}};
+    append(message, stream.format.told);
+    message.emplace_back("active_devices", devicesText(stream.devices.told));
+    if (stream.volume.told)
+        message.emplace_back("PomoSessionVolume", *stream.volume.told);
+    // Without it a second start would be the first's repetition, and those are dropped.
+    message.emplace_back("session_run", stream.runs);
+    send(stream, stream.category(), stream.running.told ? EventType::Start : EventType::Stop, std::move(message), when);
+}
+
+void Reporter::send(const Stream& stream, Category category, EventType type, Payload message, Moment when)
+{
+    if (!serviceIsThere_)
+        return;
+    message.emplace_back("kestoreporting_timestamp", when.secondsSince1970);
+    message.emplace_back("systemuptime_sec", std::int64_t{std::llround(when.uptime)});
+    service_.send(stream.session, category, type, message);
+}
+
+// Sessions.
+
+void Reporter::serviceAppeared()
+{
+    serviceIsThere_ = true;
+    for (const auto& [serial, stream] : streams_) {
+        openSession(stream);
+        // The state is told with the time since which it has held unchanged: what came before, the service
+        // was told when it was last there.
+        if (stream.running.told)
+            sendRunning(stream,
+                        later(later(stream.running.toldSince, stream.volume.toldSince),
+                              later(stream.format.toldSince, stream.devices.toldSince)));
+    }
+}
+
+void Reporter::serviceLost()
+{
+    serviceIsThere_ = false;
+}
+
+void Reporter::openSession(const Stream& stream)
+{
+    service_.create(stream.session);
+    service_.setServiceType(stream.session, serviceTypeOfRole(stream.description.role));
+    if (!stream.description.application.empty())
+        service_.setConfiguration(stream.session, {{"HostApplicationDisplayID", stream.description.application}});
+    service_.start(stream.session);
+}
+
+void Reporter::closeSession(const Stream& stream, Moment when)
+{
+    send(stream, stream.category(), EventType::Deactivate,
+         {{"session_duration", roundedToMilliseconds(when.uptime - stream.appearedAt.uptime)}}, when);
+    if (!serviceIsThere_)
+        return;
+    service_.stop(stream.session);
+    service_.destroy(stream.session);
+}
+
+} // namespace kesto_pipewire
