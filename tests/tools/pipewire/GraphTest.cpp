@@ -1,0 +1,262 @@
+// The graph of streams, fed with every order of events that a server may tell them in.
+
+#include "kesto-pipewire/Graph.h"
+#include "tools/pipewire/RecordingListener.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace kesto_pipewire {
+
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+constexpr ObjectID sink = 30;
+constexpr ObjectID node = 40;
+constexpr ObjectID link = 50;
+
+class GraphTest : public testing::Test {
+protected:
+    GraphTest() { EXPECT_FALSE(add(sink, 30, "speaker", "Audio/Sink")); }
+
+    [[nodiscard]] bool add(ObjectID id, StreamSerial serial, std::string_view name = "player",
+                           std::string_view mediaClass = "Stream/Output/Audio")
+    {
+        return graph.addNode(id, {.serial = serial, .mediaClass = mediaClass, .name = name});
+    }
+    void addStream(ObjectID id, StreamSerial serial, std::string_view name = "player",
+                   std::string_view mediaClass = "Stream/Output/Audio")
+    {
+        ASSERT_TRUE(add(id, serial, name, mediaClass));
+        graph.describeNode(id, {.binary = "player"}, "Music", now);
+        listener.news();
+    }
+
+    Moment now{1000, 10};
+    RecordingListener listener;
+    Graph graph{listener};
+};
+
+TEST_F(GraphTest, OnlyStreamsOfAudioAreWanted)
+{
+    EXPECT_TRUE(add(1, 1, "a", "Stream/Output/Audio"));
+    EXPECT_TRUE(add(2, 2, "b", "Stream/Input/Audio"));
+    EXPECT_FALSE(add(3, 3, "c", "Audio/Sink"));
+    EXPECT_FALSE(add(4, 4, "d", "Audio/Source"));
+    EXPECT_FALSE(add(5, 5, "e", "Stream/Input/Video"));
+    EXPECT_FALSE(add(6, 6, "f", "Midi/Bridge"));
+    EXPECT_FALSE(add(7, 7, "g", ""));
+}
+
+TEST_F(GraphTest, AStreamAppearsWhenItIsDescribedAndOnlyOnce)
+{
+    ASSERT_TRUE(add(node, 500));
+    EXPECT_THAT(listener.news(), IsEmpty());
+    graph.describeNode(node, {.name = "Player"}, "Music", now);
+    graph.describeNode(node, {.name = "Player"}, "Music", now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 appeared output role=Music application=Player", "500 devices ''"));
+}
+
+TEST_F(GraphTest, TheApplicationIsItsIDElseItsBinaryElseItsNameWhoeverSaysSo)
+{
+    const Identity none;
+    const Identity all{"org.example.Player", "player", "Player"};
+    const Identity binary{"", "player", "Player"};
+    const Identity name{"", "", "Player"};
+    const struct {
+        Identity onNode, onClient;
+        std::string application;
+    } cases[] = {
+        {all, none, "org.example.Player"},
+        {binary, none, "player"},
+        {name, none, "Player"},
+        {none, all, "org.example.Player"},
+        {none, binary, "player"},
+        {none, name, "Player"},
+        {name, binary, "player"},
+        {name, all, "org.example.Player"},
+        {{"", "", "On the node"}, name, "On the node"},
+        {none, none, ""},
+    };
+    StreamSerial serial = 1000;
+    for (const auto& [onNode, onClient, application] : cases) {
+        graph.describeClient(7, onClient);
+        ASSERT_TRUE(
+            graph.addNode(node, {.serial = ++serial, .mediaClass = "Stream/Output/Audio", .name = "n", .client = 7}));
+        graph.describeNode(node, onNode, "", now);
+        EXPECT_EQ(listener.news().front(), fmt::format("{} appeared output role= application={}", serial, application));
+        graph.remove(node, now);
+        listener.news();
+    }
+}
+
+TEST_F(GraphTest, DevicesAreNamedOnceHoweverManyLinksThereAre)
+{
+    addStream(node, 500);
+    EXPECT_FALSE(add(31, 31, "another", "Audio/Sink"));
+    graph.addLink(50, node, sink, now);
+    graph.addLink(51, node, sink, now);
+    graph.addLink(52, node, 31, now);
+    EXPECT_THAT(listener.news(),
+                ElementsAre("500 devices 'speaker'", "500 devices 'speaker'", "500 devices 'another,speaker'"));
+    graph.remove(50, now);
+    graph.remove(51, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'another,speaker'", "500 devices 'another'"));
+}
+
+TEST_F(GraphTest, AnInputHasTheDeviceAtTheOtherEnd)
+{
+    addStream(node, 500, "recorder", "Stream/Input/Audio");
+    graph.addLink(link, sink, node, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'"));
+}
+
+TEST_F(GraphTest, StreamsThatAreLinkedWithEachOtherAreEachOthersDevices)
+{
+    addStream(40, 500, "player");
+    addStream(41, 501, "recorder", "Stream/Input/Audio");
+    graph.addLink(link, 40, 41, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'recorder'", "501 devices 'player'"));
+}
+
+TEST_F(GraphTest, WhoComesLateLearnsOfLinksThatAreThere)
+{
+    ASSERT_TRUE(add(node, 500));
+    graph.addLink(link, node, sink, now);
+    EXPECT_THAT(listener.news(), IsEmpty());
+    graph.describeNode(node, {}, "", now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 appeared output role= application=", "500 devices 'speaker'"));
+}
+
+TEST_F(GraphTest, AnIDThatIsUsedAgainIsAnotherStream)
+{
+    addStream(node, 500);
+    graph.setRunning(node, true, now);
+    graph.addLink(link, node, sink, now);
+    graph.remove(node, now); // before its link, which servers do not do
+    listener.news();
+    ASSERT_TRUE(add(node, 501));
+    graph.describeNode(node, {}, "", now);
+    graph.setRunning(node, true, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("501 appeared output role= application=", "501 devices ''", "501 runs"));
+}
+
+TEST_F(GraphTest, RunningIsToldWhenItChanges)
+{
+    addStream(node, 500);
+    graph.setRunning(node, false, now);
+    graph.setRunning(node, true, now);
+    graph.setRunning(node, true, now);
+    EXPECT_TRUE(graph.anyStreamRuns());
+    graph.setRunning(node, false, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 runs", "500 halts"));
+    EXPECT_FALSE(graph.anyStreamRuns());
+}
+
+TEST_F(GraphTest, AStreamThatGoesRunsNoMore)
+{
+    addStream(node, 500);
+    graph.setRunning(node, true, now);
+    graph.remove(node, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 runs", "500 gone"));
+    EXPECT_FALSE(graph.anyStreamRuns());
+}
+
+TEST_F(GraphTest, WhatIsSaidOfOtherNodesIsIgnored)
+{
+    graph.setRunning(sink, true, now);
+    graph.setVolume(sink, 1, now);
+    graph.setFormat(99, {"S16LE/44100/2", 2}, now);
+    graph.describeNode(sink, {}, "", now);
+    graph.noteLateCycle(sink, 1);
+    graph.remove(99, now);
+    graph.remove(sink, now);
+
+    EXPECT_THAT(listener.news(), IsEmpty());
+}
+
+TEST_F(GraphTest, ALateCycleIsToldOnce)
+{
+    addStream(node, 500);
+    graph.noteLateCycle(node, 1000);
+    graph.noteLateCycle(node, 1000);
+    graph.noteLateCycle(node, 2000);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 late", "500 late"));
+}
+
+TEST_F(GraphTest, WhenTheServerGoesEveryStreamGoes)
+{
+    addStream(40, 500);
+    addStream(41, 501);
+    ASSERT_TRUE(add(42, 502)); // not described yet
+    graph.setRunning(40, true, now);
+    listener.news();
+    graph.clear(now);
+
+    EXPECT_THAT(listener.news(), testing::UnorderedElementsAre("500 gone", "501 gone"));
+    EXPECT_FALSE(graph.anyStreamRuns());
+    graph.addLink(link, 40, 41, now);
+    graph.setRunning(41, true, now);
+    EXPECT_THAT(listener.news(), IsEmpty());
+}
+
+TEST_F(GraphTest, StreamsBeyondTheLimitAreLeftAsideAndCounted)
+{
+    for (ObjectID id = 0; id < maximumStreams; ++id)
+        ASSERT_TRUE(add(1000 + id, 1000 + id));
+    EXPECT_FALSE(add(node, 500));
+    EXPECT_EQ(graph.ignoredObjects(), 1u);
+    graph.describeNode(node, {}, "", now);
+    EXPECT_THAT(listener.news(), IsEmpty());
+    graph.remove(1000, now);
+
+    EXPECT_TRUE(add(node, 501));
+}
+
+TEST_F(GraphTest, ObjectsOfEveryOtherKindHaveTheirLimitToo)
+{
+    for (ObjectID id = 0; id < maximumObjects + 10; ++id) {
+        EXPECT_FALSE(add(100'000 + id, id, "device", "Audio/Sink"));
+        graph.addLink(200'000 + id, sink, sink, now);
+        graph.describeClient(300'000 + id, {});
+    }
+
+    EXPECT_EQ(graph.ignoredObjects(), 31u); // one more of the nodes, among which the sink was already
+}
+
+TEST_F(GraphTest, ForeignTextIsMadeFitToBeSent)
+{
+    EXPECT_FALSE(add(31, 31, "bad\xFF\xFEname", "Audio/Sink"));
+    ASSERT_TRUE(add(node, 500));
+    graph.addLink(link, node, 31, now);
+    graph.describeNode(node, {.binary = std::string(10'000, 'x')}, "", now);
+    const auto heard = listener.news();
+
+    EXPECT_EQ(heard[0], "500 appeared output role= application=" + std::string(255, 'x'));
+    EXPECT_EQ(heard[1], "500 devices 'bad??name'");
+}
+
+TEST_F(GraphTest, TextIsNeverCutWithinACharacter)
+{
+    std::string text(254, 'x');
+    text += "\u00e9"; // two bytes, of which one would fit
+    ASSERT_TRUE(add(node, 500));
+    graph.describeNode(node, {.binary = text}, "", now);
+
+    EXPECT_EQ(listener.news()[0], "500 appeared output role= application=" + std::string(254, 'x'));
+}
+
+} // namespace
+
+} // namespace kesto_pipewire

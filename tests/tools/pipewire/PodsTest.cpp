@@ -1,0 +1,345 @@
+// Reading PipeWire's values, from values built as a server builds them and from others that it should not.
+
+#include "kesto-pipewire/Pods.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <spa/param/audio/format.h>
+#include <spa/param/audio/raw.h>
+#include <spa/param/format.h>
+#include <spa/param/param.h>
+#include <spa/param/profiler.h>
+#include <spa/param/props.h>
+#include <spa/pod/builder.h>
+
+#include <array>
+#include <cmath>
+#include <limits>
+#include <string>
+#include <vector>
+
+namespace kesto_pipewire {
+
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+// Builds one value, which lives as long as this. Its functions name what they add; `build` ends all that is open.
+class PodBuilder {
+public:
+    PodBuilder() { spa_pod_builder_init(&builder_, bytes_.data(), sizeof bytes_); }
+    PodBuilder(const PodBuilder&) = delete;
+    PodBuilder& operator=(const PodBuilder&) = delete;
+
+    PodBuilder& object(std::uint32_t type)
+    {
+        spa_pod_builder_push_object(&builder_, &open(), type, 0);
+        return *this;
+    }
+    PodBuilder& structure()
+    {
+        spa_pod_builder_push_struct(&builder_, &open());
+        return *this;
+    }
+    PodBuilder& key(std::uint32_t key)
+    {
+        spa_pod_builder_prop(&builder_, key, 0);
+        return *this;
+    }
+    // A choice of one value, as formats that are settled hold them.
+    PodBuilder& choice()
+    {
+        spa_pod_builder_push_choice(&builder_, &open(), SPA_CHOICE_None, 0);
+        return *this;
+    }
+    PodBuilder& id(std::uint32_t value)
+    {
+        spa_pod_builder_id(&builder_, value);
+        return *this;
+    }
+    PodBuilder& integer(std::int32_t value)
+    {
+        spa_pod_builder_int(&builder_, value);
+        return *this;
+    }
+    PodBuilder& wide(std::int64_t value)
+    {
+        spa_pod_builder_long(&builder_, value);
+        return *this;
+    }
+    PodBuilder& number(float value)
+    {
+        spa_pod_builder_float(&builder_, value);
+        return *this;
+    }
+    PodBuilder& truth(bool value)
+    {
+        spa_pod_builder_bool(&builder_, value);
+        return *this;
+    }
+    PodBuilder& text(const char* value)
+    {
+        spa_pod_builder_string(&builder_, value);
+        return *this;
+    }
+    PodBuilder& numbers(std::vector<float> values)
+    {
+        spa_pod_builder_array(&builder_, sizeof(float), SPA_TYPE_Float, static_cast<std::uint32_t>(values.size()),
+                              values.data());
+        return *this;
+    }
+    PodBuilder& end()
+    {
+        spa_pod_builder_pop(&builder_, &frames_[--depth_]);
+        return *this;
+    }
+    const spa_pod& build()
+    {
+        while (depth_ > 0)
+            end();
+        return *reinterpret_cast<const spa_pod*>(bytes_.data());
+    }
+
+private:
+    spa_pod_frame& open() { return frames_.at(depth_++); }
+
+    alignas(8) std::array<std::uint8_t, 8192> bytes_{};
+    std::array<spa_pod_frame, 8> frames_{};
+    std::size_t depth_ = 0;
+    spa_pod_builder builder_{};
+};
+
+// ---- Volume ----
+
+TEST(UserVolumeTest, IsTheCubeRootOfTheAmplitude)
+{
+    EXPECT_EQ(userVolume(0), 0);
+    EXPECT_EQ(userVolume(0.125), 0.5);
+    EXPECT_EQ(userVolume(1), 1);
+}
+
+TEST(UserVolumeTest, ASliderPositionIsOneNumberHoweverItWasRounded)
+{
+    EXPECT_EQ(userVolume(0.3F * 0.3F * 0.3F), 0.3);
+    EXPECT_EQ(userVolume(std::pow(19661 / 65536.0, 3)), 0.3); // what PulseAudio makes of 30 %
+}
+
+TEST(UserVolumeTest, StaysBetween0And1)
+{
+    EXPECT_EQ(userVolume(3.375), 1); // 150 %
+    EXPECT_EQ(userVolume(-1), 0);
+    EXPECT_EQ(userVolume(std::numeric_limits<double>::infinity()), 1);
+    EXPECT_EQ(userVolume(std::numeric_limits<double>::quiet_NaN()), 0);
+}
+
+TEST(ReadVolumeTest, TheLoudestChannelCounts)
+{
+    EXPECT_EQ(readVolume(PodBuilder()
+                             .object(SPA_TYPE_OBJECT_Props)
+                             .key(SPA_PROP_volume)
+                             .number(1)
+                             .key(SPA_PROP_mute)
+                             .truth(false)
+                             .key(SPA_PROP_channelVolumes)
+                             .numbers({0.001F, 0.125F})
+                             .build()),
+              0.5);
+}
+
+TEST(ReadVolumeTest, TheVolumeOfTheWholeIsAFactor)
+{
+    EXPECT_EQ(readVolume(PodBuilder()
+                             .object(SPA_TYPE_OBJECT_Props)
+                             .key(SPA_PROP_volume)
+                             .number(0.5F)
+                             .key(SPA_PROP_channelVolumes)
+                             .numbers({0.25F})
+                             .build()),
+              0.5);
+}
+
+TEST(ReadVolumeTest, MutedIsZero)
+{
+    EXPECT_EQ(readVolume(PodBuilder()
+                             .object(SPA_TYPE_OBJECT_Props)
+                             .key(SPA_PROP_mute)
+                             .truth(true)
+                             .key(SPA_PROP_channelVolumes)
+                             .numbers({1, 1})
+                             .build()),
+              0);
+}
+
+TEST(ReadVolumeTest, PropertiesWithoutAVolumeSayNothingOfIt)
+{
+    EXPECT_EQ(readVolume(PodBuilder().object(SPA_TYPE_OBJECT_Props).build()), std::nullopt);
+    EXPECT_EQ(readVolume(PodBuilder().object(SPA_TYPE_OBJECT_Props).key(SPA_PROP_mute).truth(false).build()),
+              std::nullopt);
+    EXPECT_EQ(readVolume(PodBuilder().object(SPA_TYPE_OBJECT_Props).key(SPA_PROP_channelVolumes).numbers({}).build()),
+              std::nullopt);
+}
+
+TEST(ReadVolumeTest, ValuesOfOtherTypesSayNothing)
+{
+    EXPECT_EQ(readVolume(PodBuilder().integer(1).build()), std::nullopt);
+    EXPECT_EQ(readVolume(PodBuilder()
+                             .object(SPA_TYPE_OBJECT_Props)
+                             .key(SPA_PROP_volume)
+                             .text("loud")
+                             .key(SPA_PROP_channelVolumes)
+                             .number(1)
+                             .build()),
+              std::nullopt);
+}
+
+// ---- Format ----
+
+TEST(ReadFormatTest, IsSampleRateAndChannels)
+{
+    const auto format = readFormat(PodBuilder()
+                                       .object(SPA_TYPE_OBJECT_Format)
+                                       .key(SPA_FORMAT_mediaType)
+                                       .choice()
+                                       .id(SPA_MEDIA_TYPE_audio)
+                                       .end()
+                                       .key(SPA_FORMAT_mediaSubtype)
+                                       .choice()
+                                       .id(SPA_MEDIA_SUBTYPE_raw)
+                                       .end()
+                                       .key(SPA_FORMAT_AUDIO_format)
+                                       .choice()
+                                       .id(SPA_AUDIO_FORMAT_S16_LE)
+                                       .end()
+                                       .key(SPA_FORMAT_AUDIO_rate)
+                                       .choice()
+                                       .integer(44100)
+                                       .end()
+                                       .key(SPA_FORMAT_AUDIO_channels)
+                                       .choice()
+                                       .integer(2)
+                                       .end()
+                                       .build());
+
+    EXPECT_EQ(format, (StreamFormat{"S16LE/44100/2", 2}));
+}
+
+TEST(ReadFormatTest, ValuesThatAreNoChoicesAreReadToo)
+{
+    const auto format = readFormat(PodBuilder()
+                                       .object(SPA_TYPE_OBJECT_Format)
+                                       .key(SPA_FORMAT_mediaType)
+                                       .id(SPA_MEDIA_TYPE_audio)
+                                       .key(SPA_FORMAT_AUDIO_format)
+                                       .id(SPA_AUDIO_FORMAT_F32P)
+                                       .key(SPA_FORMAT_AUDIO_rate)
+                                       .integer(48000)
+                                       .key(SPA_FORMAT_AUDIO_channels)
+                                       .integer(6)
+                                       .build());
+
+    EXPECT_EQ(format, (StreamFormat{"F32P/48000/6", 6}));
+}
+
+TEST(ReadFormatTest, EncodedSoundIsNamedAfterItsCoding)
+{
+    const auto format = readFormat(PodBuilder()
+                                       .object(SPA_TYPE_OBJECT_Format)
+                                       .key(SPA_FORMAT_mediaType)
+                                       .id(SPA_MEDIA_TYPE_audio)
+                                       .key(SPA_FORMAT_mediaSubtype)
+                                       .id(SPA_MEDIA_SUBTYPE_iec958)
+                                       .key(SPA_FORMAT_AUDIO_rate)
+                                       .integer(48000)
+                                       .build());
+
+    EXPECT_EQ(format, (StreamFormat{"iec958/48000", 0}));
+}
+
+TEST(ReadFormatTest, WhatIsNoFormatOfSoundIsNone)
+{
+    EXPECT_EQ(readFormat(PodBuilder().integer(1).build()), std::nullopt);
+    EXPECT_EQ(readFormat(PodBuilder().object(SPA_TYPE_OBJECT_Format).build()), std::nullopt);
+    EXPECT_EQ(
+        readFormat(
+            PodBuilder().object(SPA_TYPE_OBJECT_Format).key(SPA_FORMAT_mediaType).id(SPA_MEDIA_TYPE_video).build()),
+        std::nullopt);
+}
+
+// ---- Late cycles ----
+
+// A profile of cycles, each with its clock and its followers, as the server's profiler makes it.
+class ProfileBuilder : public PodBuilder {
+public:
+    ProfileBuilder() { structure(); }
+
+    ProfileBuilder& cycle(std::int64_t began)
+    {
+        object(SPA_TYPE_OBJECT_Profiler);
+        key(SPA_PROFILER_clock).structure().integer(0).integer(0).text("clock").wide(began).wide(0).end();
+        return *this;
+    }
+    ProfileBuilder& follower(std::int32_t node, const char* name, std::int32_t status)
+    {
+        key(SPA_PROFILER_followerBlock).structure().integer(node).text(name);
+        wide(0).wide(0).wide(0).wide(0).integer(status).end();
+        return *this;
+    }
+    ProfileBuilder& endCycle()
+    {
+        end();
+        return *this;
+    }
+};
+
+std::vector<std::string> lateCycles(const spa_pod& profile)
+{
+    std::vector<std::string> late;
+    readLateCycles(profile, [&late](std::uint32_t node, std::int64_t began) {
+        late.push_back(std::to_string(node) + " " + std::to_string(began));
+    });
+    return late;
+}
+
+TEST(ReadLateCyclesTest, TellsEveryFollowerThatHasNotFinished)
+{
+    ProfileBuilder profile;
+    profile.cycle(1000).follower(40, "player", 3).follower(41, "late", 1).endCycle();
+    profile.cycle(2000).follower(40, "player", 2).follower(41, "late", 0).endCycle();
+
+    EXPECT_THAT(lateCycles(profile.build()), ElementsAre("41 1000", "40 2000", "41 2000"));
+}
+
+TEST(ReadLateCyclesTest, WhatIsNoProfileTellsNothing)
+{
+    EXPECT_THAT(lateCycles(PodBuilder().integer(1).build()), IsEmpty());
+    EXPECT_THAT(lateCycles(PodBuilder().structure().integer(1).text("x").build()), IsEmpty());
+    EXPECT_THAT(lateCycles(PodBuilder().structure().object(SPA_TYPE_OBJECT_Props).build()), IsEmpty());
+}
+
+TEST(ReadLateCyclesTest, BlocksThatAreCutShortTellNothing)
+{
+    EXPECT_THAT(lateCycles(PodBuilder()
+                               .structure()
+                               .object(SPA_TYPE_OBJECT_Profiler)
+                               .key(SPA_PROFILER_clock)
+                               .structure()
+                               .integer(0)
+                               .integer(0)
+                               .text("clock")
+                               .wide(1000)
+                               .end()
+                               .key(SPA_PROFILER_followerBlock)
+                               .structure()
+                               .integer(41)
+                               .end()
+                               .key(SPA_PROFILER_followerBlock)
+                               .integer(41)
+                               .build()),
+                IsEmpty());
+}
+
+} // namespace
+
+} // namespace kesto_pipewire

@@ -1,0 +1,51 @@
+// A listener that remembers what it heard of streams, as lines of text.
+#pragma once
+
+#include "kesto-pipewire/Stream.h"
+
+#include <fmt/format.h>
+
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace kesto_pipewire {
+
+class RecordingListener : public StreamListener {
+public:
+    void appeared(StreamSerial stream, const StreamDescription& description, Moment) override
+    {
+        hear(stream,
+             fmt::format("appeared {} role={} application={}",
+                         description.direction == Direction::Output ? "output" : "input", description.role,
+                         description.application));
+    }
+    void runningChanged(StreamSerial stream, bool running, Moment) override
+    {
+        hear(stream, running ? "runs" : "halts");
+    }
+    void volumeChanged(StreamSerial stream, double volume, Moment) override
+    {
+        hear(stream, fmt::format("volume {}", volume));
+    }
+    void formatChanged(StreamSerial stream, const StreamFormat& format, Moment) override
+    {
+        hear(stream, fmt::format("format {} {}", format.text, format.channels));
+    }
+    void devicesChanged(StreamSerial stream, const std::string& devices, Moment) override
+    {
+        hear(stream, fmt::format("devices '{}'", devices));
+    }
+    void cycleWasLate(StreamSerial stream, Moment) override { hear(stream, "late"); }
+    void gone(StreamSerial stream, Moment) override { hear(stream, "gone"); }
+
+    // What was heard since the last time that it was asked for, such as "500 runs".
+    std::vector<std::string> news() { return std::exchange(heard_, {}); }
+
+private:
+    void hear(StreamSerial stream, const std::string& what) { heard_.push_back(fmt::format("{} {}", stream, what)); }
+
+    std::vector<std::string> heard_;
+};
+
+} // namespace kesto_pipewire

@@ -1,0 +1,174 @@
+#include "kesto-pipewire/Graph.h"
+
+#include "kesto-pipewire/Text.h"
+
+#include <set>
+
+namespace kesto_pipewire {
+
+namespace {
+
+constexpr std::size_t maximumDevicesBytes = 1024;
+
+std::optional<Direction> directionOfClass(std::string_view mediaClass)
+{
+    if (mediaClass == "Stream/Output/Audio")
+        return Direction::Output;
+    if (mediaClass == "Stream/Input/Audio")
+        return Direction::Input;
+    return std::nullopt;
+}
+
+} // namespace
+
+bool Graph::hasRoom(std::size_t count, std::size_t maximum)
+{
+    if (count < maximum)
+        return true;
+    ++ignoredObjects_;
+    return false;
+}
+
+bool Graph::addNode(ObjectID node, const NodeAnnouncement& announcement)
+{
+    const auto direction = directionOfClass(announcement.mediaClass);
+    if (!hasRoom(nodes_.size(), maximumObjects) || (direction && !hasRoom(streams_, maximumStreams)))
+        return false;
+    const auto isNew =
+        nodes_.try_emplace(node, Node{announcement.serial, tidyText(announcement.name), direction, announcement.client})
+            .second;
+    streams_ += isNew && direction;
+    return isNew && direction;
+}
+
+void Graph::addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Moment when)
+{
+    if (!hasRoom(links_.size(), maximumObjects))
+        return;
+    links_[link] = {outputNode, inputNode};
+    tellDevices(outputNode, when);
+    tellDevices(inputNode, when);
+}
+
+void Graph::remove(ObjectID object, Moment when)
+{
+    if (const auto link = links_.extract(object)) {
+        tellDevices(link.mapped().outputNode, when);
+        tellDevices(link.mapped().inputNode, when);
+    }
+    removeNode(object, when);
+    clients_.erase(object);
+}
+
+void Graph::removeNode(ObjectID id, Moment when)
+{
+    const auto removed = nodes_.extract(id);
+    if (!removed)
+        return;
+    const auto& node = removed.mapped();
+    streams_ -= node.direction.has_value();
+    runningStreams_ -= node.isRunning;
+    if (node.hasAppeared)
+        listener_.gone(node.serial, when);
+
+    // Links go before their nodes; one that did not must not tie the ID's next owner to this one's partners.
+    std::erase_if(links_, [id](const auto& link) { return link.second.touches(id); });
+}
+
+void Graph::clear(Moment when)
+{
+    for (const auto& [id, node] : nodes_)
+        if (node.hasAppeared)
+            listener_.gone(node.serial, when);
+    nodes_.clear();
+    links_.clear();
+    clients_.clear();
+    streams_ = runningStreams_ = 0;
+}
+
+void Graph::describeClient(ObjectID client, Identity identity)
+{
+    if (clients_.contains(client) || hasRoom(clients_.size(), maximumObjects))
+        clients_[client] = std::move(identity);
+}
+
+void Graph::describeNode(ObjectID id, const Identity& identity, std::string_view role, Moment when)
+{
+    const auto found = nodes_.find(id);
+    if (found == nodes_.end() || !found->second.direction || found->second.hasAppeared)
+        return;
+    auto& node = found->second;
+    node.hasAppeared = true;
+    listener_.appeared(node.serial, {*node.direction, std::string(role), applicationOf(node, identity)}, when);
+    tellDevices(id, when);
+}
+
+std::string Graph::applicationOf(const Node& node, const Identity& own) const
+{
+    const auto client = node.client ? clients_.find(*node.client) : clients_.end();
+    const auto& owner = client == clients_.end() ? own : client->second;
+    for (const auto field : {&Identity::applicationID, &Identity::binary, &Identity::name})
+        for (const auto* identity : {&own, &owner})
+            if (const auto& text = identity->*field; !text.empty())
+                return tidyText(text);
+    return {};
+}
+
+Graph::Node* Graph::appearedStream(ObjectID id)
+{
+    const auto found = nodes_.find(id);
+    return found != nodes_.end() && found->second.hasAppeared ? &found->second : nullptr;
+}
+
+void Graph::setRunning(ObjectID id, bool running, Moment when)
+{
+    auto* node = appearedStream(id);
+    if (!node || node->isRunning == running)
+        return;
+    node->isRunning = running;
+    runningStreams_ += running ? 1 : -1;
+    listener_.runningChanged(node->serial, running, when);
+}
+
+void Graph::setVolume(ObjectID id, double volume, Moment when)
+{
+    if (const auto* node = appearedStream(id))
+        listener_.volumeChanged(node->serial, volume, when);
+}
+
+void Graph::setFormat(ObjectID id, const StreamFormat& format, Moment when)
+{
+    if (const auto* node = appearedStream(id))
+        listener_.formatChanged(node->serial, format, when);
+}
+
+void Graph::noteLateCycle(ObjectID id, std::int64_t began)
+{
+    auto* node = appearedStream(id);
+    if (!node || began <= node->lastLateCycle)
+        return;
+    node->lastLateCycle = began;
+    listener_.cycleWasLate(node->serial, momentOfMonotonic(began));
+}
+
+std::string Graph::devicesOf(ObjectID id) const
+{
+    std::set<std::string_view> names; // a link a channel: the same device many times
+    for (const auto& [ignored, link] : links_)
+        if (link.touches(id))
+            if (const auto peer = nodes_.find(link.outputNode == id ? link.inputNode : link.outputNode);
+                peer != nodes_.end() && !peer->second.name.empty())
+                names.insert(peer->second.name);
+    std::string devices;
+    for (const auto name : names)
+        devices.append(devices.empty() ? "" : ",").append(name);
+    return tidyText(devices, maximumDevicesBytes);
+}
+
+void Graph::tellDevices(ObjectID id, Moment when)
+{
+    if (const auto* node = appearedStream(id))
+        listener_.devicesChanged(node->serial, devicesOf(id), when);
+}
+
+} // namespace kesto_pipewire

@@ -1,0 +1,99 @@
+// The part of PipeWire's object graph that concerns streams: who plays, on whose behalf, linked with what.
+//
+// The server tells of objects one by one, under IDs that it uses again at once. This keeps just enough of
+// them to turn those tellings into changes of streams. It is plain data and knows nothing of libpipewire,
+// so that every order of events can be tried without a server. All of it on one thread.
+#pragma once
+
+#include "kesto-pipewire/Stream.h"
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <unordered_map>
+
+namespace kesto_pipewire {
+
+// Any client of PipeWire can make objects; beyond these numbers they are left aside and counted.
+constexpr std::size_t maximumStreams = 512;
+constexpr std::size_t maximumObjects = 16384; // of each kind
+
+using ObjectID = std::uint32_t;
+
+// Who a program says it is, on its client object, its node or both.
+struct Identity {
+    std::string applicationID{}; // `application.id`
+    std::string binary{}; // `application.process.binary`
+    std::string name{}; // `application.name`
+};
+
+// What the server announces of a node.
+struct NodeAnnouncement {
+    StreamSerial serial = 0;
+    std::string_view mediaClass{};
+    std::string_view name{};
+    std::optional<ObjectID> client{};
+};
+
+class Graph {
+public:
+    explicit Graph(StreamListener& listener) : listener_(listener) { }
+
+    // Answers whether the node is a stream whose further events are wanted.
+    [[nodiscard]] bool addNode(ObjectID node, const NodeAnnouncement& announcement);
+    void addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Moment when);
+    // An object of any kind is gone.
+    void remove(ObjectID object, Moment when);
+    // The server is gone, and everything with it.
+    void clear(Moment when);
+
+    void describeClient(ObjectID client, Identity identity);
+    // The first description of a stream is its appearance; the others say nothing new.
+    void describeNode(ObjectID node, const Identity& identity, std::string_view role, Moment when);
+
+    // Of nodes that have not appeared as streams these are ignored.
+    void setRunning(ObjectID node, bool running, Moment when);
+    void setVolume(ObjectID node, double volume, Moment when);
+    void setFormat(ObjectID node, const StreamFormat& format, Moment when);
+    // A node was late in the cycle that began then, in nanoseconds of CLOCK_MONOTONIC; repeated for one cycle, it
+    // counts once. It is told in arrears: the ID may be another node's by now, whose cycles began later.
+    void noteLateCycle(ObjectID node, std::int64_t began);
+
+    [[nodiscard]] bool anyStreamRuns() const noexcept { return runningStreams_ > 0; }
+    // Objects left aside because there were too many.
+    [[nodiscard]] std::uint64_t ignoredObjects() const noexcept { return ignoredObjects_; }
+
+private:
+    struct Node {
+        StreamSerial serial = 0;
+        std::string name;
+        std::optional<Direction> direction; // of streams
+        std::optional<ObjectID> client;
+        bool hasAppeared = false;
+        bool isRunning = false;
+        std::int64_t lastLateCycle = 0; // when it began
+    };
+    struct Link {
+        ObjectID outputNode = 0;
+        ObjectID inputNode = 0;
+        [[nodiscard]] bool touches(ObjectID node) const noexcept { return outputNode == node || inputNode == node; }
+    };
+
+    [[nodiscard]] bool hasRoom(std::size_t count, std::size_t maximum);
+    [[nodiscard]] Node* appearedStream(ObjectID node);
+    [[nodiscard]] std::string applicationOf(const Node& node, const Identity& own) const;
+    [[nodiscard]] std::string devicesOf(ObjectID node) const;
+    void tellDevices(ObjectID node, Moment when);
+    void removeNode(ObjectID node, Moment when);
+
+    StreamListener& listener_;
+    std::unordered_map<ObjectID, Node> nodes_;
+    std::unordered_map<ObjectID, Link> links_;
+    std::unordered_map<ObjectID, Identity> clients_;
+    std::size_t streams_ = 0;
+    std::size_t runningStreams_ = 0;
+    std::uint64_t ignoredObjects_ = 0;
+};
+
+} // namespace kesto_pipewire

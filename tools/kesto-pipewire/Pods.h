@@ -1,0 +1,29 @@
+// Reading of what PipeWire says in its own binary values ("pods"): volumes, formats and late cycles.
+#pragma once
+
+#include "kesto-pipewire/Stream.h"
+
+#include <cstdint>
+#include <functional>
+#include <optional>
+
+struct spa_pod;
+
+namespace kesto_pipewire {
+
+// A stream's volume on the user's scale from the linear amplitudes of its channels. The user's slider is the
+// cube root of the amplitude and shows the loudest channel; more than 1, which some mixers allow, counts as
+// 1. Four decimals, so that equal positions of a slider make equal numbers. Any thread.
+[[nodiscard]] double userVolume(double amplitude);
+
+// The volume that a node's properties hold, 0 when muted; nothing when they hold none. Any thread.
+[[nodiscard]] std::optional<double> readVolume(const spa_pod& properties);
+
+// The audio format, or nothing when the value holds none, as when the stream is suspended. Any thread.
+[[nodiscard]] std::optional<StreamFormat> readFormat(const spa_pod& format);
+
+// Calls back for every node that was not ready in its cycle, with its object ID and when the cycle began, in
+// nanoseconds of CLOCK_MONOTONIC. Any thread.
+void readLateCycles(const spa_pod& profile, const std::function<void(std::uint32_t node, std::int64_t began)>& tell);
+
+} // namespace kesto_pipewire

@@ -1,0 +1,17 @@
+// Foreign text made fit to be sent: names come from whatever program runs, and the reporting service ends a
+// connection over text that is not UTF-8.
+#pragma once
+
+#include <cstddef>
+#include <string>
+#include <string_view>
+
+namespace kesto_pipewire {
+
+constexpr std::size_t maximumNameBytes = 255;
+
+// The text cut to that many bytes, never within a character. In text that is not UTF-8, every byte that is
+// not ASCII becomes "?". Any thread.
+[[nodiscard]] std::string tidyText(std::string_view text, std::size_t maximumBytes = maximumNameBytes);
+
+} // namespace kesto_pipewire
