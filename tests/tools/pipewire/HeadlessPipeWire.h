@@ -1,0 +1,76 @@
+// A real PipeWire of a test's own, and programs that play and record on it.
+#pragma once
+
+#include <sys/types.h>
+
+#include <filesystem>
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace kesto_pipewire {
+
+// A program that runs until this object ends it. Its standard input is a pipe from the test, its output
+// can be read; what it says on standard error goes to the test's.
+class Program {
+public:
+    using Environment = std::map<std::string, std::string>; // in addition to the test's own
+
+    // The first argument is the program, searched for in PATH.
+    Program(const std::vector<std::string>& arguments, const Environment& environment);
+    ~Program(); // by SIGTERM
+    Program(const Program&) = delete;
+    Program& operator=(const Program&) = delete;
+
+    void write(const std::string& text) const;
+    // The next line of its output, or an empty one when the output has ended.
+    [[nodiscard]] std::string readLine() const;
+    void kill(int signal) const;
+    void closeInput();
+    // Waits for it to end by itself. Its exit status, or 128 and its signal's number.
+    int wait();
+    [[nodiscard]] pid_t pid() const noexcept { return pid_; }
+
+private:
+    pid_t pid_ = -1;
+    int input_ = -1;
+    int output_ = -1;
+};
+
+// Runs one private instance at a time; `restart` gives another one at the same place.
+class HeadlessPipeWire {
+public:
+    HeadlessPipeWire();
+    ~HeadlessPipeWire();
+    HeadlessPipeWire(const HeadlessPipeWire&) = delete;
+    HeadlessPipeWire& operator=(const HeadlessPipeWire&) = delete;
+
+    // Why there is none although none is broken: programs that are not installed. Else empty.
+    [[nodiscard]] const std::string& reasonToSkip() const noexcept { return reasonToSkip_; }
+
+    void start();
+    void kill(); // PipeWire itself, without warning, and then what belongs to it
+    [[nodiscard]] std::string socket() const;
+    [[nodiscard]] Program::Environment environment() const;
+
+    [[nodiscard]] std::unique_ptr<Program> run(const std::vector<std::string>& arguments) const;
+    // Runs it to its end; its whole output. An exit status other than 0 fails the test.
+    std::string runToEnd(const std::vector<std::string>& arguments) const;
+
+    // Players and recorders. The tone player obeys "pause\n" and "play\n".
+    [[nodiscard]] std::unique_ptr<Program> playTone(const std::string& role) const;
+    [[nodiscard]] std::unique_ptr<Program> playOverPulse(const std::string& role) const;
+    [[nodiscard]] std::unique_ptr<Program> record() const;
+
+    // PulseAudio's number of the stream that plays, which is `pactl`'s name for it. There must be just one.
+    [[nodiscard]] std::string onlySinkInput() const;
+
+private:
+    std::filesystem::path directory_;
+    std::unique_ptr<Program> instance_;
+    pid_t server_ = -1;
+    std::string reasonToSkip_;
+};
+
+} // namespace kesto_pipewire

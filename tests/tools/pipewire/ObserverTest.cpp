@@ -1,0 +1,347 @@
+// What the observer sees of real streams on a real PipeWire without hardware.
+
+#include "kesto-pipewire/Observer.h"
+#include "tools/pipewire/HeadlessPipeWire.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <pipewire/pipewire.h>
+
+#include <csignal>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+
+namespace kesto_pipewire {
+
+namespace {
+
+constexpr double patience = 20; // seconds; what is waited for comes within a fraction of one
+
+// A stream as the observer has told it.
+struct SeenStream {
+    StreamDescription description;
+    bool runs = false;
+    std::optional<double> volume{};
+    std::optional<StreamFormat> format{};
+    std::string devices{};
+    int lateCycles = 0;
+    bool isGone = false;
+    // When it last began or ceased to run, changed its volume, and went.
+    double runningChangedAt = 0;
+    double volumeChangedAt = 0;
+    double goneAt = 0;
+};
+
+// Remembers every stream that was ever told, in the order of their appearance.
+class SeenStreams : public StreamListener {
+public:
+    explicit SeenStreams(std::function<void()> changed) : changed_(std::move(changed)) { }
+
+    void appeared(StreamSerial serial, const StreamDescription& description, Moment) override
+    {
+        EXPECT_TRUE(indices_.insert_or_assign(serial, streams.size()).second || at(serial).isGone);
+        indices_[serial] = streams.size();
+        streams.push_back({.description = description});
+        changed_();
+    }
+    void runningChanged(StreamSerial serial, bool running, Moment when) override
+    {
+        at(serial).runs = running;
+        at(serial).runningChangedAt = when.secondsSince1970;
+        changed_();
+    }
+    void volumeChanged(StreamSerial serial, double volume, Moment when) override
+    {
+        if (std::exchange(at(serial).volume, volume) != volume)
+            at(serial).volumeChangedAt = when.secondsSince1970;
+        changed_();
+    }
+    void formatChanged(StreamSerial serial, const StreamFormat& format, Moment) override
+    {
+        at(serial).format = format;
+        changed_();
+    }
+    void devicesChanged(StreamSerial serial, const std::string& devices, Moment) override
+    {
+        at(serial).devices = devices;
+        changed_();
+    }
+    void cycleWasLate(StreamSerial serial, Moment) override
+    {
+        ++at(serial).lateCycles;
+        changed_();
+    }
+    void gone(StreamSerial serial, Moment when) override
+    {
+        at(serial).isGone = true;
+        at(serial).goneAt = when.secondsSince1970;
+        changed_();
+    }
+
+    std::vector<SeenStream> streams;
+
+private:
+    SeenStream& at(StreamSerial serial) { return streams.at(indices_.at(serial)); }
+
+    std::function<void()> changed_;
+    std::map<StreamSerial, std::size_t> indices_;
+};
+
+class ObserverTest : public testing::Test {
+protected:
+    void SetUp() override
+    {
+        if (!server.reasonToSkip().empty())
+            GTEST_SKIP() << server.reasonToSkip();
+        pw_init(nullptr, nullptr);
+        loop.emplace();
+        timeout = loop->addTimer([this] {
+            timedOut = true;
+            loop->quit();
+        });
+        observer.emplace(*loop, server.socket(), seen, diagnostics);
+    }
+    void TearDown() override
+    {
+        observer.reset();
+        timeout = {};
+        loop.reset();
+        if (server.reasonToSkip().empty())
+            pw_deinit();
+    }
+
+    // Lets things happen until the condition holds.
+    [[nodiscard]] bool happens(std::function<bool()> condition)
+    {
+        awaited = std::move(condition);
+        timedOut = false;
+        loop->arm(timeout, patience);
+        if (!awaited())
+            loop->run();
+        loop->disarm(timeout);
+        awaited = nullptr;
+        return !timedOut;
+    }
+    [[nodiscard]] SeenStream& first() { return seen.streams.at(0); }
+    // Whether the stream of that number, the first being 0, runs and all is known of it.
+    [[nodiscard]] bool plays(std::size_t number) const
+    {
+        if (seen.streams.size() <= number)
+            return false;
+        const auto& stream = seen.streams[number];
+        return stream.runs && stream.volume && stream.format && !stream.devices.empty();
+    }
+    void quitWhenItHappened()
+    {
+        if (awaited && awaited())
+            loop->quit();
+    }
+
+    HeadlessPipeWire server;
+    Diagnostics diagnostics{false};
+    SeenStreams seen{[this] { quitWhenItHappened(); }};
+    std::optional<Loop> loop;
+    Source timeout;
+    bool timedOut = false;
+    std::function<bool()> awaited;
+    std::optional<Observer> observer;
+};
+
+TEST_F(ObserverTest, APlayerIsSeenWithAllThatIsKnownOfIt)
+{
+    observer->start();
+    const auto player = server.playTone("Game");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+
+    EXPECT_EQ(first().description.direction, Direction::Output);
+    EXPECT_EQ(first().description.role, "Game");
+    EXPECT_EQ(first().description.application, "tone-player");
+    EXPECT_EQ(first().volume, 1);
+    EXPECT_EQ(first().format, (StreamFormat{"S16LE/44100/2", 2}));
+    EXPECT_EQ(first().devices, "null-sink");
+}
+
+TEST_F(ObserverTest, APlayerOverPulseIsSeenUnderItsOwnName)
+{
+    observer->start();
+    const auto player = server.playOverPulse("phone");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+
+    EXPECT_EQ(first().description.role, "Communication");
+    EXPECT_EQ(first().description.application, "pacat"); // and not the server's that speaks for it
+}
+
+TEST_F(ObserverTest, WhoComesLateSeesWhatAlreadyPlays)
+{
+    const auto player = server.playOverPulse("music");
+    server.runToEnd({"sh", "-c", "until pactl list short sink-inputs | grep -q .; do sleep 0.01; done"});
+    server.runToEnd({"pactl", "set-sink-input-volume", server.onlySinkInput(), "30%"});
+    observer->start();
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+
+    EXPECT_EQ(first().description.role, "Music");
+    EXPECT_EQ(first().volume, 0.3);
+    EXPECT_EQ(first().devices, "null-sink");
+}
+
+TEST_F(ObserverTest, APauseAndItsEndAreSeen)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    auto before = currentMoment().secondsSince1970;
+    player->write("pause\n");
+    ASSERT_TRUE(happens([this] { return !first().runs; }));
+    EXPECT_THAT(first().runningChangedAt, testing::AllOf(testing::Ge(before), testing::Le(before + 0.5)));
+    EXPECT_EQ(first().devices, "null-sink");
+    before = currentMoment().secondsSince1970;
+    player->write("play\n");
+    ASSERT_TRUE(happens([this] { return first().runs; }));
+
+    EXPECT_THAT(first().runningChangedAt, testing::AllOf(testing::Ge(before), testing::Le(before + 0.5)));
+    EXPECT_EQ(seen.streams.size(), 1u);
+}
+
+TEST_F(ObserverTest, VolumeAndMuteAreSeenOnTheScaleOfTheUser)
+{
+    observer->start();
+    const auto player = server.playOverPulse("music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    const auto input = server.onlySinkInput();
+    server.runToEnd({"pactl", "set-sink-input-volume", input, "50%"});
+    EXPECT_TRUE(happens([this] { return first().volume == 0.5; }));
+    server.runToEnd({"pactl", "set-sink-input-volume", input, "20%", "40%"});
+    EXPECT_TRUE(happens([this] { return first().volume == 0.4; }));
+    server.runToEnd({"pactl", "set-sink-input-mute", input, "1"});
+    EXPECT_TRUE(happens([this] { return first().volume == 0; }));
+    server.runToEnd({"pactl", "set-sink-input-mute", input, "0"});
+    EXPECT_TRUE(happens([this] { return first().volume == 0.4; }));
+    server.runToEnd({"pactl", "set-sink-input-volume", input, "150%"});
+
+    EXPECT_TRUE(happens([this] { return first().volume == 1; }));
+}
+
+TEST_F(ObserverTest, TwoStreamsAtOnceAreToldApart)
+{
+    observer->start();
+    const auto one = server.playOverPulse("music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    const auto input = server.onlySinkInput();
+    const auto other = server.playTone("Game");
+    ASSERT_TRUE(happens([this] { return plays(1); }));
+    server.runToEnd({"pactl", "set-sink-input-volume", input, "50%"});
+    ASSERT_TRUE(happens([this] { return first().volume == 0.5; }));
+    EXPECT_EQ(seen.streams[1].volume, 1);
+    other->write("pause\n");
+    ASSERT_TRUE(happens([this] { return !seen.streams[1].runs; }));
+    EXPECT_TRUE(first().runs);
+    one->kill(SIGKILL);
+    ASSERT_TRUE(happens([this] { return first().isGone; }));
+
+    EXPECT_FALSE(seen.streams[1].isGone);
+}
+
+TEST_F(ObserverTest, ARecorderIsSeenAsAnInput)
+{
+    observer->start();
+    const auto recorder = server.record();
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+
+    EXPECT_EQ(first().description.direction, Direction::Input);
+    EXPECT_EQ(first().devices, "null-sink");
+}
+
+TEST_F(ObserverTest, AStreamThatIsKilledIsGone)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    player->kill(SIGKILL);
+
+    EXPECT_TRUE(happens([this] { return first().isGone; }));
+}
+
+TEST_F(ObserverTest, AStreamFollowsItsDevices)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    server.runToEnd({"pactl", "load-module", "module-null-sink", "sink_name=headset"});
+    server.runToEnd({"pactl", "set-default-sink", "headset"});
+    ASSERT_TRUE(happens([this] { return first().devices == "headset" && first().runs; }));
+    server.runToEnd({"pactl", "unload-module", "module-null-sink"});
+
+    EXPECT_TRUE(happens([this] { return first().devices == "null-sink" && first().runs; }));
+    EXPECT_EQ(seen.streams.size(), 1u);
+}
+
+TEST_F(ObserverTest, AStreamWithoutADeviceDoesNotRun)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    server.runToEnd({"pw-cli", "destroy", "null-sink"});
+    ASSERT_TRUE(happens([this] { return first().devices.empty() && !first().runs; }));
+    server.runToEnd({"pactl", "load-module", "module-null-sink", "sink_name=headset"});
+
+    EXPECT_TRUE(happens([this] { return first().devices == "headset" && first().runs; }));
+}
+
+TEST_F(ObserverTest, AStreamThatDoesNotKeepPaceIsLate)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    player->kill(SIGSTOP);
+    ASSERT_TRUE(happens([this] { return first().lateCycles >= 5; }));
+    player->kill(SIGCONT);
+    player->write("pause\n");
+
+    EXPECT_TRUE(happens([this] { return !first().runs; }));
+}
+
+TEST_F(ObserverTest, WhenPipeWireDiesItsStreamsGoAndItsSuccessorsAreSeen)
+{
+    observer->start();
+    {
+        const auto player = server.playTone("Music");
+        ASSERT_TRUE(happens([this] { return plays(0); }));
+        const auto before = currentMoment().secondsSince1970;
+        server.kill();
+        ASSERT_TRUE(happens([this] { return first().isGone; }));
+        EXPECT_LE(first().goneAt, before + 0.5 + patience / 100);
+    }
+    server.start();
+    const auto player = server.playTone("Game");
+
+    EXPECT_TRUE(happens([this] { return plays(1); }));
+    EXPECT_EQ(seen.streams[1].description.role, "Game");
+    EXPECT_FALSE(seen.streams[1].isGone);
+}
+
+TEST_F(ObserverTest, AnObserverThatWasThereFirstFindsPipeWireWhenItComes)
+{
+    server.kill();
+    observer->start();
+    server.start();
+    const auto player = server.playTone("Music");
+
+    EXPECT_TRUE(happens([this] { return plays(0); }));
+}
+
+TEST_F(ObserverTest, WhenItStopsEveryStreamIsGone)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    observer->stop();
+
+    EXPECT_TRUE(first().isGone);
+}
+
+} // namespace
+
+} // namespace kesto_pipewire

@@ -1,0 +1,33 @@
+// What the program says to whoever runs it: lines on standard error, which a service manager keeps.
+#pragma once
+
+#include <fmt/format.h>
+
+#include <cstdio>
+#include <utility>
+
+namespace kesto_pipewire {
+
+class Diagnostics {
+public:
+    explicit Diagnostics(bool verbose) : isVerbose_(verbose) { }
+
+    [[nodiscard]] bool isVerbose() const noexcept { return isVerbose_; }
+
+    // Something that changes what is reported. Any thread, as the other one.
+    template <typename... Values> void say(fmt::format_string<Values...> format, Values&&... values) const
+    {
+        fmt::print(stderr, "kesto-pipewire: {}\n", fmt::format(format, std::forward<Values>(values)...));
+    }
+    // Something that only matters to who looks for it.
+    template <typename... Values> void detail(fmt::format_string<Values...> format, Values&&... values) const
+    {
+        if (isVerbose_)
+            say(format, std::forward<Values>(values)...);
+    }
+
+private:
+    bool isVerbose_;
+};
+
+} // namespace kesto_pipewire

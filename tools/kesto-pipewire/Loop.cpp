@@ -1,0 +1,136 @@
+#include "kesto-pipewire/Loop.h"
+
+#include <pipewire/loop.h>
+#include <pipewire/main-loop.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cmath>
+#include <ctime>
+#include <system_error>
+#include <utility>
+
+namespace kesto_pipewire {
+
+struct Source::Watched : std::enable_shared_from_this<Watched> {
+    Watched(pw_loop* given, Callback call) : loop(given), callback(std::move(call)) { }
+    ~Watched() { release(); }
+    Watched(const Watched&) = delete;
+    Watched& operator=(const Watched&) = delete;
+
+    void release()
+    {
+        if (auto* released = std::exchange(source, nullptr))
+            pw_loop_destroy_source(loop, released);
+    }
+    static void fire(void* data)
+    {
+        const auto self = static_cast<Watched*>(data)->shared_from_this(); // the callback may let go of it
+        self->callback();
+    }
+
+    pw_loop* loop;
+    Callback callback;
+    spa_source* source = nullptr;
+};
+
+Source::Source(Source&& other) noexcept = default;
+
+Source& Source::operator=(Source&& other) noexcept
+{
+    std::swap(watched_, other.watched_);
+    return *this;
+}
+
+Source::~Source()
+{
+    if (watched_)
+        watched_->release();
+}
+
+void Loop::Release::operator()(pw_main_loop* loop) const noexcept
+{
+    pw_main_loop_destroy(loop);
+}
+
+Loop::Loop() : loop_(pw_main_loop_new(nullptr))
+{
+    if (!loop_)
+        throw std::system_error(errno, std::generic_category(), "cannot create an event loop");
+}
+
+Loop::~Loop() = default;
+
+void Loop::run()
+{
+    pw_main_loop_run(loop_.get());
+}
+
+void Loop::quit()
+{
+    pw_main_loop_quit(loop_.get());
+}
+
+pw_loop* Loop::raw() const noexcept
+{
+    return pw_main_loop_get_loop(loop_.get());
+}
+
+// What the four kinds of source have in common; `start` makes the loop's own source with the given data.
+template <typename Start> Source Loop::watch(Source::Callback callback, Start start)
+{
+    auto watched = std::make_shared<Source::Watched>(raw(), std::move(callback));
+    watched->source = start(watched.get());
+    if (!watched->source)
+        throw std::system_error(errno, std::generic_category(), "cannot watch an event");
+    return Source(std::move(watched));
+}
+
+Source Loop::addTimer(Source::Callback callback)
+{
+    return watch(std::move(callback), [this](void* data) {
+        return pw_loop_add_timer(raw(), [](void* watched, std::uint64_t) { Source::Watched::fire(watched); }, data);
+    });
+}
+
+Source Loop::addSignal(int signal, Source::Callback callback)
+{
+    return watch(std::move(callback), [this, signal](void* data) {
+        return pw_loop_add_signal(raw(), signal, [](void* watched, int) { Source::Watched::fire(watched); }, data);
+    });
+}
+
+Source Loop::addReadable(int descriptor, Source::Callback callback)
+{
+    return watch(std::move(callback), [this, descriptor](void* data) {
+        return pw_loop_add_io(
+            raw(), descriptor, SPA_IO_IN, false,
+            [](void* watched, int, std::uint32_t) { Source::Watched::fire(watched); }, data);
+    });
+}
+
+Source Loop::addWakeup(Source::Callback callback)
+{
+    return watch(std::move(callback), [this](void* data) {
+        return pw_loop_add_event(raw(), [](void* watched, std::uint64_t) { Source::Watched::fire(watched); }, data);
+    });
+}
+
+void Loop::arm(Source& timer, double seconds)
+{
+    const auto nanoseconds = std::llround(std::max(seconds, 1e-6) * 1e9); // a time of 0 would disarm it
+    timespec value{nanoseconds / 1'000'000'000, nanoseconds % 1'000'000'000};
+    pw_loop_update_timer(raw(), timer.watched_->source, &value, nullptr, false);
+}
+
+void Loop::disarm(Source& timer)
+{
+    pw_loop_update_timer(raw(), timer.watched_->source, nullptr, nullptr, false);
+}
+
+void Loop::wake(Source& wakeup)
+{
+    pw_loop_signal_event(raw(), wakeup.watched_->source);
+}
+
+} // namespace kesto_pipewire

@@ -1,0 +1,123 @@
+#include "kesto-pipewire/Observer.h"
+
+#include <pipewire/context.h>
+#include <pipewire/extensions/profiler.h>
+#include <pipewire/impl.h>
+#include <pipewire/keys.h>
+
+#include <algorithm>
+#include <cerrno>
+#include <cstdlib>
+#include <system_error>
+
+namespace kesto_pipewire {
+
+namespace {
+
+// A server that is being started is there within the first pauses; one that is not there at all costs two
+// wake-ups a minute, should its socket's appearance go unnoticed.
+constexpr double firstPause = 0.1;
+constexpr double longestPause = 30;
+
+std::string environment(const char* name)
+{
+    const auto* value = std::getenv(name);
+    return value ? value : "";
+}
+
+// Where PipeWire's own library looks for the server's socket.
+std::filesystem::path socketPath(std::string remote)
+{
+    if (remote.empty())
+        remote = environment("PIPEWIRE_REMOTE");
+    if (remote.empty())
+        remote = "pipewire-0";
+    for (const auto* folder : {"PIPEWIRE_RUNTIME_DIR", "XDG_RUNTIME_DIR", "USERPROFILE"})
+        if (const auto path = environment(folder); !path.empty())
+            return std::filesystem::path(path) / remote; // which an absolute path replaces
+    return std::filesystem::path("/run/pipewire") / remote;
+}
+
+} // namespace
+
+void Observer::Release::operator()(pw_context* context) const noexcept
+{
+    pw_context_destroy(context);
+}
+
+Observer::Observer(Loop& loop, std::string remote, StreamListener& listener, const Diagnostics& diagnostics)
+    : loop_(loop),
+      remote_(std::move(remote)),
+      diagnostics_(diagnostics),
+      graph_(listener),
+      retry_(loop.addTimer([this] { connect(); })),
+      loss_(loop.addWakeup([this] { serverWasLost(); })),
+      pause_(firstPause)
+      // No configuration file: what an ordinary client loads is for streams of its own.
+      ,
+      context_(pw_context_new(loop.raw(), pw_properties_new(PW_KEY_CONFIG_NAME, "null", nullptr), 0))
+{
+    const auto load = [this](const char* module) {
+        return pw_context_load_module(context_.get(), module, nullptr, nullptr) != nullptr;
+    };
+    if (!context_ || !load("libpipewire-module-protocol-native") || !load(PW_EXTENSION_MODULE_PROFILER))
+        throw std::system_error(errno, std::generic_category(), "cannot set up PipeWire's library");
+}
+
+Observer::~Observer() = default;
+
+void Observer::start()
+{
+    connect();
+}
+
+void Observer::stop()
+{
+    loop_.disarm(retry_);
+    socketWatch_.reset();
+    connection_.reset();
+    graph_.clear(currentMoment());
+    if (const auto ignored = graph_.ignoredObjects())
+        diagnostics_.say("{} of PipeWire's objects were left aside, being too many at once", ignored);
+}
+
+void Observer::connect()
+{
+    if (connection_)
+        return;
+    connection_ = Connection::open(*context_, remote_, graph_, diagnostics_, [this] {
+        lostAt_ = currentMoment();
+        loop_.wake(loss_);
+    });
+    if (!connection_)
+        return waitForServer();
+    diagnostics_.detail("connected to PipeWire");
+    loop_.disarm(retry_);
+    socketWatch_.reset();
+    pause_ = firstPause;
+}
+
+void Observer::waitForServer()
+{
+    if (!socketWatch_) {
+        diagnostics_.say("waiting for PipeWire at {}", socketPath(remote_).string());
+        socketWatch_.emplace(loop_, socketPath(remote_), [this] {
+            pause_ = firstPause;
+            loop_.arm(retry_, 0); // later: this watch cannot be taken down from within its own callback
+        });
+    }
+    loop_.arm(retry_, pause_);
+    pause_ = std::min(pause_ * 2, longestPause);
+}
+
+void Observer::serverWasLost()
+{
+    if (!connection_)
+        return;
+    diagnostics_.say("PipeWire has gone");
+    connection_.reset();
+    graph_.clear(lostAt_);
+    waitForServer();
+}
+
+} // namespace kesto_pipewire

@@ -1,0 +1,108 @@
+// kesto-pipewire: reports every stream of a running PipeWire to the reporting service, so that nothing needs
+// to be changed in any player.
+//
+// Here the three parts meet: the observer, which speaks PipeWire; the reporter, which decides what is
+// told; and the connection to the service. The program runs until a signal ends it and then ends every
+// session; it outlives both servers and waits for whichever is away.
+
+#include "kesto-pipewire/Diagnostics.h"
+#include "kesto-pipewire/Loop.h"
+#include "kesto-pipewire/Observer.h"
+#include "kesto-pipewire/Reporter.h"
+#include "kesto-pipewire/ServiceConnection.h"
+
+#include <CLI/CLI.hpp>
+#include <pipewire/pipewire.h>
+
+#include <sysexits.h>
+#include <unistd.h>
+
+#include <csignal>
+#include <cstdlib>
+#include <string>
+#include <system_error>
+
+namespace kesto_pipewire {
+
+namespace {
+
+constexpr int exitUndelivered = 1;
+
+struct Options {
+    std::string socket;
+    std::string remote;
+    bool verbose = false;
+};
+
+// Brings PipeWire's library up and down again around everything that uses it.
+class Library {
+public:
+    explicit Library(const Options& options)
+    {
+        pw_init(nullptr, nullptr);
+        // What it would say by itself we say in our own words, unless somebody asks for it.
+        if (!options.verbose && !std::getenv("PIPEWIRE_DEBUG"))
+            pw_log_set_level(SPA_LOG_LEVEL_NONE);
+    }
+    ~Library() { pw_deinit(); }
+    Library(const Library&) = delete;
+    Library& operator=(const Library&) = delete;
+};
+
+// Other programs choose reporter IDs too, perhaps from 1 upwards. The process ID keeps ours apart, and 2^53,
+// beyond which readers of JSON lose digits, out of reach.
+ReporterID firstReporterID()
+{
+    return (ReporterID{getpid()} << 24) + 1;
+}
+
+int run(const Options& options)
+{
+    const Diagnostics diagnostics(options.verbose);
+    const Library library(options);
+    Loop loop;
+    const auto end = [&loop] { loop.quit(); };
+    const auto terminate = loop.addSignal(SIGTERM, end);
+    const auto interrupt = loop.addSignal(SIGINT, end);
+
+    ServiceConnection service(loop, options.socket, diagnostics);
+    Source alarm;
+    Reporter reporter(service, firstReporterID(), [&](std::optional<double> uptime) {
+        if (uptime)
+            loop.arm(alarm, *uptime - currentMoment().uptime);
+        else
+            loop.disarm(alarm);
+    });
+    alarm = loop.addTimer([&reporter] { reporter.settle(currentMoment()); });
+    Observer observer(loop, options.remote, reporter, diagnostics);
+
+    service.open(
+        {.appeared = [&reporter] { reporter.serviceAppeared(); }, .lost = [&reporter] { reporter.serviceLost(); }});
+    observer.start();
+    loop.run();
+    observer.stop();
+    return service.close() ? EX_OK : exitUndelivered;
+}
+
+} // namespace
+
+} // namespace kesto_pipewire
+
+int main(int argumentCount, char** arguments)
+{
+    kesto_pipewire::Options options;
+    CLI::App app("Reports every stream of a running PipeWire to the Kesto reporting service.", "kesto-pipewire");
+    app.add_option("--socket", options.socket, "Socket of the reporting service")->type_name("PATH");
+    app.add_option("--remote", options.remote, "Name or socket of the PipeWire server")->type_name("NAME");
+    app.add_flag("--verbose", options.verbose, "Say everything that is reported");
+    app.set_version_flag("--version", std::string("kesto-pipewire ") + kesto_version());
+    try {
+        app.parse(argumentCount, arguments);
+        return kesto_pipewire::run(options);
+    } catch (const CLI::ParseError& error) {
+        return app.exit(error) == 0 ? EX_OK : EX_USAGE;
+    } catch (const std::system_error& error) {
+        fmt::print(stderr, "kesto-pipewire: {}\n", error.what());
+        return error.code() == std::errc::invalid_argument ? EX_CONFIG : EX_OSERR;
+    }
+}
