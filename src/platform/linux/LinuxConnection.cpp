@@ -125,14 +125,7 @@ void LinuxConnection::read()
 
 void LinuxConnection::endOfStream()
 {
-    bool wasReset = false;
-    {
-        const foundation::Lock lock(lock_);
-        wasReset = wasReset_;
-    }
-    if (wasReset)
-        breakOff(systemErrorText(ECONNRESET));
-    else if (reader_.isInsideFrame())
+    if (reader_.isInsideFrame())
         breakOff("the stream ends inside a frame");
     else
         end(std::nullopt);
@@ -236,7 +229,6 @@ void LinuxConnection::writeOutput()
         outputStart_ += static_cast<std::size_t>(count);
     } else if (errno != EAGAIN && errno != EINTR) { // reading goes on: what the peer sent before is still there
         cannotSend_ = true;
-        wasReset_ = errno == ECONNRESET;
         dropOutput();
     }
     if (outputStart_ == output_.size()) {

@@ -104,7 +104,6 @@ private:
     bool isResumed_ KESTO_GUARDED_BY(lock_) = false;
     bool isOver_ KESTO_GUARDED_BY(lock_) = false;
     bool cannotSend_ KESTO_GUARDED_BY(lock_) = false; // the peer takes nothing any more
-    bool wasReset_ KESTO_GUARDED_BY(lock_) = false; // as a write was told, so that reading will not be
 };
 
 } // namespace platform
