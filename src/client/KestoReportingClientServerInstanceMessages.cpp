@@ -4,6 +4,7 @@
 // Both orders are part of the contract.
 #define KESTO_LOG_FILE "KestoReportingClientServerInstance"
 #include "client/KestoReportingClientServerInstance.h"
+#include "foundation/Format.h"
 #include "platform/Connection.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
@@ -11,8 +12,6 @@
 #include "sinks/KestoReportingTrelmBridge.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
-
-#include <fmt/ranges.h>
 
 void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary message, AudioEventCategory category,
                                                      std::uint16_t type, std::optional<ReporterIDs> reporterIDs,
@@ -25,7 +24,7 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
     submit([message = Message{std::move(message), category, type, std::move(processName).value_or("")},
             reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
-                  reporterIDs ? fmt::format("[{}]", fmt::join(*reporterIDs, ",")) : "(null)");
+                  reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientSendMessage);
         const auto delegate = self.delegate_.lock();
         if (!delegate || !delegate->isReportingEnabled())

@@ -3,9 +3,9 @@
 #include "client/KestoReportingServiceProtocolAdapter.h"
 
 #include "foundation/Cbor.h"
+#include "foundation/Format.h"
 
 #include <array>
-#include <fmt/format.h>
 #include <limits>
 #include <utility>
 
@@ -77,8 +77,8 @@ public:
         const auto exact = number ? number->exactly<Integer>() : std::nullopt;
         if (!exact)
             refuse(name,
-                   fmt::format("an integer from {} to {}", std::numeric_limits<Integer>::min(),
-                               std::numeric_limits<Integer>::max()));
+                   foundation::format("an integer from {} to {}", std::numeric_limits<Integer>::min(),
+                                      std::numeric_limits<Integer>::max()));
         return exact.value_or(0);
     }
 
@@ -122,7 +122,7 @@ private:
     void refuse(std::string_view name, std::string_view expected)
     {
         if (!refusal_)
-            refusal_ = fmt::format("argument {} is not {}", name, expected);
+            refusal_ = foundation::format("argument {} is not {}", name, expected);
     }
 
     std::span<const Value> rest_;
@@ -213,18 +213,18 @@ std::expected<void, Connection::Violation> KestoReportingServiceProtocolAdapter:
         return violation("a call's number is an unsigned 64-bit integer");
     const auto methodNumber = values[1].number() ? values[1].number()->exactly<std::int64_t>() : std::nullopt;
     if (!methodNumber) // not repeated to the log, where it could fill a disk or forge lines
-        return violation(fmt::format("a call's method is an integer from 1 to {}", methods.size()));
+        return violation(foundation::format("a call's method is an integer from 1 to {}", methods.size()));
     if (*methodNumber < 1 || std::cmp_greater(*methodNumber, methods.size()))
-        return violation(fmt::format("unknown method {}; there are 1 to {}", *methodNumber, methods.size()));
+        return violation(foundation::format("unknown method {}; there are 1 to {}", *methodNumber, methods.size()));
     const Method& method = methods[static_cast<std::size_t>(*methodNumber) - 1];
     if (values.size() - headCount != method.argumentCount)
-        return violation(
-            fmt::format("{} takes {} arguments, not {}", method.name, method.argumentCount, values.size() - headCount));
+        return violation(foundation::format("{} takes {} arguments, not {}", method.name, method.argumentCount,
+                                            values.size() - headCount));
 
     const Connection::CallScope scope(*connection);
     Arguments arguments(values.subspan(headCount));
     method.call(*exportedObject_, arguments, ReplyAddress(connection_, *callNumber, std::move(call.credit)));
     if (arguments.refusal())
-        return violation(fmt::format("{}: {}", method.name, *arguments.refusal()));
+        return violation(foundation::format("{}: {}", method.name, *arguments.refusal()));
     return {};
 }

@@ -2,12 +2,12 @@
 // each kind of channel.
 #define KESTO_LOG_FILE "KestoReportingDriverUtility"
 #include "driver/KestoReportingDriverUtility.h"
+#include "foundation/Format.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <algorithm>
-#include <fmt/format.h>
 #include <iterator>
 
 namespace {
@@ -125,15 +125,15 @@ void KestoReportingDriverUtility::processHistogramData(const platform::Reporting
         lower = std::min(lower, bucket.lower);
         upper = std::max(upper, bucket.upper);
         if (bucket.hits != 0)
-            fmt::format_to(std::back_inserter(buckets), "{}-{}:{};", bucket.lower, bucket.upper, bucket.hits);
+            foundation::format_to(std::back_inserter(buckets), "{}-{}:{};", bucket.lower, bucket.upper, bucket.hits);
     }
     if (buckets.empty())
         return;
     buckets.pop_back();
     driverStats.push_back(
         {std::string_view(getDriverStatsKey(channel, "Histogram")),
-         fmt::format("count={},lower={},upper={},min={},max={},unit={}::{}", channel.buckets.size(), lower, upper,
-                     channel.minimum, channel.maximum, channel.unit.value_or("(null)"), buckets)});
+         foundation::format("count={},lower={},upper={},min={},max={},unit={}::{}", channel.buckets.size(), lower,
+                            upper, channel.minimum, channel.maximum, channel.unit.value_or("(null)"), buckets)});
 }
 
 void KestoReportingDriverUtility::processStateData(const platform::ReportingChannel& channel, DriverStats& driverStats)
@@ -141,8 +141,8 @@ void KestoReportingDriverUtility::processStateData(const platform::ReportingChan
     std::string data;
     for (const auto& state : channel.states)
         if (state.residency != 0)
-            fmt::format_to(std::back_inserter(data), "name:{},transition:{},residency:{},duty_cycle:{:f};", state.name,
-                           state.transitions, state.residency, state.dutyCycle);
+            foundation::format_to(std::back_inserter(data), "name:{},transition:{},residency:{},duty_cycle:{:f};",
+                                  state.name, state.transitions, state.residency, state.dutyCycle);
     KESTO_LOG(KestoReportingDriverUtilityCategory(), Debug, "the current reported data is : {}", data);
     driverStats.push_back({std::string_view(getDriverStatsKey(channel, "State")), data});
 }

@@ -2,12 +2,11 @@
 #include "session/KestoReportingSession.h"
 
 #include "foundation/Cbor.h"
+#include "foundation/Format.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
-
-#include <fmt/format.h>
 
 const foundation::String KestoReportingTraceTypeKtrace("ktrace");
 
@@ -29,10 +28,10 @@ KestoReportingSession::~KestoReportingSession()
 
 std::string KestoReportingSession::description() const
 {
-    return fmt::format("reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}", reporterID_,
-                       serviceName_.empty() ? "(null)" : serviceName_,
-                       processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
-                       KestoReportingUtilityRetrieveAppName(configuration()).text(), started_ ? 1 : 0);
+    return foundation::format("reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}",
+                              reporterID_, serviceName_.empty() ? "(null)" : serviceName_,
+                              processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
+                              KestoReportingUtilityRetrieveAppName(configuration()).text(), started_ ? 1 : 0);
 }
 
 void KestoReportingSession::setServiceType(AudioServiceType type)

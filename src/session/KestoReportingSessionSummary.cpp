@@ -1,6 +1,7 @@
 // The session's summary: every value that each key took, in one event, and on internal builds the whole message
 // store as a file that diagnostic tools read.
 #define KESTO_LOG_FILE "KestoReportingSession"
+#include "foundation/Format.h"
 #include "foundation/LocalTime.h"
 #include "foundation/PrettyJsonWriter.h"
 #include "platform/Platform.h"
@@ -8,7 +9,6 @@
 #include "utility/KestoReportingUtility.h"
 
 #include <filesystem>
-#include <fmt/format.h>
 #include <unordered_map>
 
 namespace {
@@ -153,6 +153,6 @@ std::string KestoReportingSession::summaryFileName() const
     const std::string time =
         foundation::localTimeText(platform::current().clock.secondsSince1970(), "{:%Y%m%d-%H%M%S%z}");
     const std::string application = KestoReportingUtilityRetrieveAppName(configuration()).text();
-    return fmt::format("{}-kesto-{}-{}.json", time, fileNamePart(application),
-                       KestoReportingUtilityGenerateServiceNameFromServiceType(serviceType_));
+    return foundation::format("{}-kesto-{}-{}.json", time, fileNamePart(application),
+                              KestoReportingUtilityGenerateServiceNameFromServiceType(serviceType_));
 }

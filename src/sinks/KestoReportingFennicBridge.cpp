@@ -1,10 +1,10 @@
 // Both events of a message share one payload, which is built when the first of them needs it.
 #include "sinks/KestoReportingFennicBridge.h"
 
+#include "foundation/Format.h"
 #include "platform/Platform.h"
 #include "utility/KestoReportingUtility.h"
 
-#include <fmt/format.h>
 #include <mutex>
 
 namespace {
@@ -54,6 +54,6 @@ void KestoReportingFennicBridge::handleEvent(const foundation::Dictionary& messa
             payload = std::make_shared<LazyPayload>(message, session);
         analytics.sendAnalyticsEventLazy(std::move(eventName), [payload] { return payload->build(); });
     };
-    offer(fmt::format("com.quarn.kesto.{}.{}", categoryName, typeName));
-    offer(fmt::format("com.quarn.{}.{}.{}", serviceName, categoryName, typeName));
+    offer(foundation::format("com.quarn.kesto.{}.{}", categoryName, typeName));
+    offer(foundation::format("com.quarn.{}.{}.{}", serviceName, categoryName, typeName));
 }
