@@ -1,0 +1,58 @@
+// The example configuration files are what they say they are: right, and saying nothing but the defaults.
+#include "platform/linux/AnalyticsConfiguration.h"
+#include "platform/linux/TomlFile.h"
+
+#include <fstream>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <iterator>
+#include <regex>
+#include <string>
+
+namespace platform {
+namespace {
+
+using foundation::Dictionary;
+using foundation::Value;
+using testing::IsEmpty;
+
+std::string textOf(const std::string& name)
+{
+    std::ifstream file(std::string(KESTO_EXAMPLES) + "/" + name);
+    EXPECT_TRUE(file) << name;
+    return {std::istreambuf_iterator(file), {}};
+}
+
+Dictionary parsed(const std::string& text)
+{
+    const auto values = parseToml(text);
+    EXPECT_TRUE(values) << "line " << values.error().line << ": " << values.error().reason;
+    return values.value_or(Dictionary());
+}
+
+TEST(ExampleConfiguration, AnalyticsShowsEveryDefault)
+{
+    const Dictionary values = parsed(textOf("analytics.toml"));
+    const auto checked = readAnalyticsConfiguration(values);
+    EXPECT_THAT(checked.problems, IsEmpty());
+    EXPECT_EQ(checked.configuration, AnalyticsConfiguration());
+    EXPECT_EQ(values.size(), 4U) << "a key that the example does not show";
+}
+
+TEST(ExampleConfiguration, DeviceAndFeaturesAreOffAsWithoutAFile)
+{
+    EXPECT_EQ(parsed(textOf("device.toml")), (Dictionary{{"InternalBuild", false}}));
+    EXPECT_EQ(parsed(textOf("feature-flags.toml")), (Dictionary{{"Sonalis", Dictionary{{"Tracing", false}}}}));
+}
+
+TEST(ExampleConfiguration, PreferencesAreShownButNotSet)
+{
+    const std::string text = textOf("preferences/com.quarn.kesto.toml");
+    EXPECT_EQ(parsed(text), Dictionary());
+    const std::regex commentedSetting("(^|\n)# ([a-z_]+ = )");
+    EXPECT_EQ(parsed(std::regex_replace(text, commentedSetting, "$1$2")),
+              (Dictionary{{"device_name", "Kitchen radio"}, {"disable_reporting", true}}));
+}
+
+} // namespace
+} // namespace platform
