@@ -74,8 +74,10 @@ void FakeAnalytics::clear()
 
 bool FakeAnalytics::isAnalyticsEventUsed(std::string_view eventName)
 {
-    const foundation::Lock lock(lock_);
     const std::string name(eventName);
+    if (observer_)
+        observer_(name);
+    const foundation::Lock lock(lock_);
     asked_.push_back(name);
     return std::ranges::any_of(used_,
                                [&](const auto& pattern) { return fnmatch(pattern.c_str(), name.c_str(), 0) == 0; });

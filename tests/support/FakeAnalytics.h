@@ -5,6 +5,8 @@
 #include "foundation/Mutex.h"
 #include "platform/Analytics.h"
 
+#include <functional>
+#include <iosfwd>
 #include <optional>
 #include <string>
 #include <vector>
@@ -23,6 +25,9 @@ class FakeAnalytics final : public platform::Analytics {
 public:
     // From now on events whose name matches the glob are wanted; none is at first.
     void use(std::string pattern);
+
+    // Is told each name when it is asked about.
+    void setObserver(std::function<void(const std::string&)> observer) { observer_ = std::move(observer); }
 
     // The names asked about, and those of the events sent, in order. Builds nothing.
     [[nodiscard]] std::vector<std::string> asked() const;
@@ -44,6 +49,7 @@ private:
         PayloadBuilder builder;
         std::optional<foundation::Dictionary> payload;
     };
+    std::function<void(const std::string&)> observer_;
     mutable foundation::Mutex lock_;
     std::vector<std::string> used_ KESTO_GUARDED_BY(lock_);
     std::vector<std::string> asked_ KESTO_GUARDED_BY(lock_);

@@ -48,11 +48,11 @@ private:
 };
 
 // Matches a line of that level, tag and text.
-inline auto IsLine(platform::LogLevel level, std::string_view tag, std::string_view message)
+MATCHER_P3(IsLine, level, tag, message,
+           std::string(negation ? "is not " : "is ") + std::string(platform::name(level)) + ' ' + tag + " \"" + message
+               + '"')
 {
-    return testing::AllOf(testing::Field("level", &LogLine::level, level),
-                          testing::Field("tag", &LogLine::tag, std::string(tag)),
-                          testing::Field("message", &LogLine::message, std::string(message)));
+    return arg.level == level && arg.tag == tag && arg.message == message;
 }
 
 } // namespace support

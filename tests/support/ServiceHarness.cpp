@@ -26,13 +26,13 @@ Answers TestClient::answersTo(std::uint64_t number) const
 void TestClient::close()
 {
     connection_->close();
-    platform_.workQueues.runAll();
+    queues_->runAll();
 }
 
 void TestClient::breakOff()
 {
     connection_->breakOff();
-    platform_.workQueues.runAll();
+    queues_->runAll();
 }
 
 std::shared_ptr<KestoReportingSession> TestClient::session(std::int64_t reporterID) const
@@ -57,7 +57,7 @@ TestClient ServiceHarness::connect(std::string processName)
     auto connection = listener.connect(processIdentifier);
     platform.workQueues.runAll();
     forget();
-    return {platform, std::move(connection), service->getAllClients().back()};
+    return {platform.workQueues, std::move(connection), service->getAllClients().back()};
 }
 
 void ServiceHarness::forget()

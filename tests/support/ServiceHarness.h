@@ -48,9 +48,9 @@ inline const Answers unanswered;
 // A client process. Declared after its service, so that it goes first.
 class TestClient {
 public:
-    TestClient(TestPlatform& platform, std::shared_ptr<FakeConnection> connection,
-               std::shared_ptr<KestoReportingClientServerInstance> object)
-        : platform_(platform),
+    TestClient(FakeWorkQueues& queues, std::shared_ptr<FakeConnection> connection,
+               const std::shared_ptr<KestoReportingClientServerInstance>& object)
+        : queues_(&queues),
           connection_(std::move(connection)),
           object_(object)
     {
@@ -60,7 +60,7 @@ public:
     template <typename... Arguments> Answers call(Method method, const Arguments&... arguments)
     {
         const std::uint64_t number = submit(method, {foundation::Value(arguments)...});
-        platform_.workQueues.runAll();
+        queues_->runAll();
         return answersTo(number);
     }
     // Only makes the call; its number.
@@ -78,7 +78,7 @@ public:
     [[nodiscard]] std::shared_ptr<KestoReportingSession> session(std::int64_t reporterID) const;
 
 private:
-    TestPlatform& platform_;
+    FakeWorkQueues* queues_;
     std::shared_ptr<FakeConnection> connection_;
     std::weak_ptr<KestoReportingClientServerInstance> object_;
     std::uint64_t lastCall_ = 0;

@@ -1,0 +1,714 @@
+// A client's operations on sessions, called through the protocol: what is answered, what is said in which order, and
+// whose sessions each of them reaches.
+#include "client/KestoReportingClientServerInstance.h"
+#include "support/ServiceHarness.h"
+
+#include <gmock/gmock.h>
+#include <iostream>
+
+namespace {
+
+using namespace support;
+using enum platform::LogLevel;
+using foundation::Array;
+using foundation::Dictionary;
+using foundation::Value;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+constexpr std::uint32_t clientCreate = 0x21044814;
+constexpr std::uint32_t clientStart = 0x21044818;
+constexpr std::uint32_t clientStop = 0x2104481C;
+constexpr std::uint32_t clientDestroy = 0x21044820;
+constexpr std::uint32_t sessionCreated = 0x21044828;
+constexpr std::uint32_t sessionStarted = 0x2104482C;
+constexpr std::uint32_t sessionStopping = 0x21044830;
+constexpr std::uint32_t sessionDestroyed = 0x21044834;
+constexpr std::uint32_t sessionMessageAccepted = 0x21044838;
+
+constexpr Answers::size_type once = 1;
+
+// The description of a session of the first client without service type and configuration.
+std::string described(std::int64_t reporterID, bool started)
+{
+    return "\"reporterID=" + std::to_string(reporterID)
+        + ",serviceName=(null),ownerPid=1001,HostApplicationDisplayID=Unknown,started=" + (started ? "1\"" : "0\"");
+}
+
+class ClientTest : public testing::Test {
+protected:
+    ServiceHarness harness;
+    TestClient player = harness.connect("player");
+    TestClient recorder = harness.connect("recorder");
+    TestPlatform& platform = harness.platform;
+
+    // What was said, but for what a session says of its volume when it stops.
+    [[nodiscard]] std::vector<LogLine> lines() const
+    {
+        auto lines = harness.platform.log.lines();
+        std::erase_if(lines, [](const LogLine& line) { return line.tag == "keri"; });
+        return lines;
+    }
+
+    Answers create(std::int64_t reporterID) { return player.call(CreateReportingSession, reporterID); }
+    Answers start(std::int64_t reporterID) { return player.call(StartReportingSessionForID, reporterID); }
+    Answers stop(std::int64_t reporterID) { return player.call(StopReportingSessionForID, reporterID); }
+};
+
+// --- making
+
+TEST_F(ClientTest, IsMadeWithItsProcessAndNoSessions)
+{
+    const auto client = std::make_shared<KestoReportingClientServerInstance>(17, harness.service);
+    EXPECT_EQ(client->processIdentifier(), 17);
+    EXPECT_EQ(client->clientReportingSessionMap().size(), 0U);
+    EXPECT_EQ(client->clientStartDate(), std::nullopt);
+    EXPECT_EQ(client->clientProcessName(), std::nullopt);
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Default, "kerc", "new client with pid 17")));
+}
+
+TEST_F(ClientTest, SaysThatItGoes)
+{
+    std::make_shared<KestoReportingClientServerInstance>(17, harness.service);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Default, "kerc", "new client with pid 17"),
+                            IsLine(Default, "kerc", "dealloc 17 from the server client list")));
+}
+
+TEST_F(ClientTest, DoesNothingOnTheCallersThreadButSubmit)
+{
+    for (const auto& [method, arguments] :
+         std::vector<std::pair<Method, Array>>{{CreateReportingSession, {42}},
+                                               {SetServiceType, {4, 42}},
+                                               {GetServiceNameForReporterID, {42}},
+                                               {SetConfiguration, {Dictionary{}, 42}},
+                                               {StartReportingSessionForID, {42}},
+                                               {SendMessage, {Dictionary{}, 4, 1, Array{42}}},
+                                               {StopReportingSessionForID, {42}},
+                                               {DestroyReportingSession, {42}},
+                                               {ValidReporterID, {42}},
+                                               {GetAllReporters, {}}}) {
+        const auto call = player.submit(method, arguments);
+        EXPECT_EQ(platform.workQueues.pending(), 1U);
+        EXPECT_THAT(lines(), IsEmpty());
+        EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+        EXPECT_THAT(player.answersTo(call), IsEmpty());
+        platform.workQueues.runAll();
+        platform.log.clear();
+        platform.traceMarkers.take();
+    }
+}
+
+TEST_F(ClientTest, ServesCallsInTheOrderInWhichTheyCame)
+{
+    player.submit(CreateReportingSession, {42});
+    player.submit(SetServiceType, {4, 42});
+    const auto asked = player.submit(GetServiceNameForReporterID, {42});
+    platform.workQueues.runAll();
+    EXPECT_EQ(player.answersTo(asked), answeredOnce({null, 4}));
+}
+
+// --- create
+
+TEST_F(ClientTest, CreatesASessionOwnedByItsProcess)
+{
+    EXPECT_EQ(create(42), answeredOnce(succeeded));
+    ASSERT_NE(player.session(42), nullptr);
+    EXPECT_EQ(player.session(42)->reporterID(), 42);
+    EXPECT_THAT(player.session(42)->processIdentifiers(), ElementsAre(1001));
+    EXPECT_FALSE(player.session(42)->started());
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 42"),
+                            IsLine(Info, "kerr", "created reporting session for ID: 42"),
+                            IsLine(Default, "kerc", "session created for reporter 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientCreate, sessionCreated));
+}
+
+TEST_F(ClientTest, ReplacesASessionOfTheSameIDWithoutStoppingOrReportingIt)
+{
+    platform.analytics.use("*");
+    create(42);
+    start(42);
+    const std::weak_ptr<KestoReportingSession> first = player.session(42);
+    harness.forget();
+    platform.analytics.clear();
+
+    EXPECT_EQ(create(42), answeredOnce(succeeded));
+    EXPECT_TRUE(first.expired());
+    EXPECT_FALSE(player.session(42)->started());
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 42"),
+                            IsLine(Info, "kerr", "created reporting session for ID: 42"),
+                            IsLine(Info, "kerr", "deallocing this session 42"),
+                            IsLine(Default, "kerc", "session created for reporter 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientCreate, sessionCreated, sessionDestroyed));
+    EXPECT_THAT(platform.analytics.sent(), IsEmpty());
+}
+
+TEST_F(ClientTest, NeverAnswersTheStartOfASessionThatWasReplaced)
+{
+    create(42);
+    const auto started = player.submit(StartReportingSessionForID, {42});
+    create(42);
+    stop(42);
+    EXPECT_EQ(player.answersTo(started), unanswered);
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U) << "and nothing waits for it";
+}
+
+TEST_F(ClientTest, CreatesNoMoreSessionsThanItMayHave)
+{
+    constexpr auto most = static_cast<std::int64_t>(KestoReportingClientServerInstance::mostSessions);
+    for (std::int64_t reporterID = 1; reporterID <= most; ++reporterID)
+        player.submit(CreateReportingSession, {reporterID});
+    platform.workQueues.runAll();
+
+    harness.forget();
+    EXPECT_EQ(create(most + 1), answeredOnce(succeeded)) << "the client is answered as always";
+    EXPECT_EQ(player.session(most + 1), nullptr);
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 10001")));
+    const auto replaced = player.session(1);
+    EXPECT_EQ(create(1), answeredOnce(succeeded));
+    EXPECT_NE(player.session(1), replaced) << "one that is there already may be replaced";
+    EXPECT_EQ(recorder.call(CreateReportingSession, most + 1), answeredOnce(succeeded));
+    EXPECT_NE(recorder.session(most + 1), nullptr) << "another client has a limit of its own";
+
+    player.call(DestroyReportingSession, 2);
+    create(most + 1);
+    EXPECT_NE(player.session(most + 1), nullptr);
+
+    harness.forget();
+    player.close();
+    EXPECT_THAT(platform.log.lines("kerc"),
+                testing::Contains(IsLine(Error, "kerc", "client 1001 was refused 1 sessions: it may have 10000")));
+}
+
+// --- set service type
+
+TEST_F(ClientTest, SetsAServiceType)
+{
+    create(42);
+    harness.forget();
+    EXPECT_EQ(player.call(SetServiceType, 4, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(42)->serviceType(), 4);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "setting service type 4 for reporter 42"),
+                            IsLine(Info, "kerr", "setting service type alarms"),
+                            IsLine(Default, "kerc", "service type 4 set for reporter  42")));
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+}
+
+TEST_F(ClientTest, SetsNoServiceTypeOfASessionThatItDoesNotHave)
+{
+    recorder.call(CreateReportingSession, 43);
+    harness.forget();
+    EXPECT_EQ(player.call(SetServiceType, 4, 43), answeredOnce(succeeded));
+    EXPECT_EQ(recorder.session(43)->serviceType(), 0);
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "setting service type 4 for reporter 43")));
+}
+
+TEST_F(ClientTest, SetsNoServiceTypeOfSessionZero)
+{
+    create(0);
+    harness.forget();
+    EXPECT_EQ(player.call(SetServiceType, 4, 0), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(0)->serviceType(), 0);
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "setting service type 4 for reporter 0")));
+}
+
+// --- get service type
+
+TEST_F(ClientTest, TellsTheServiceTypeOfItsOwnSession)
+{
+    create(42);
+    player.call(SetServiceType, 4, 42);
+    harness.forget();
+    EXPECT_EQ(player.call(GetServiceNameForReporterID, 42), answeredOnce({null, 4}));
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "fetching seviceType"),
+                            IsLine(Default, "kerc", "returning service type 4 for reporter  42")));
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+}
+
+TEST_F(ClientTest, TellsTheServiceTypeOfAnotherClientsSession)
+{
+    create(42);
+    player.call(SetServiceType, 4, 42);
+    harness.forget();
+    EXPECT_EQ(recorder.call(GetServiceNameForReporterID, 42), answeredOnce({null, 4}));
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "fetching seviceType"),
+                            IsLine(Info, "kers", "found reporting session 42 for client 1001"),
+                            IsLine(Default, "kerc", "returning service type 4 for reporter  42")));
+}
+
+TEST_F(ClientTest, PrefersItsOwnSessionToThatOfAClientThatCameBefore)
+{
+    create(42);
+    player.call(SetServiceType, 4, 42);
+    recorder.call(CreateReportingSession, 42);
+    recorder.call(SetServiceType, 7, 42);
+    EXPECT_EQ(recorder.call(GetServiceNameForReporterID, 42), answeredOnce({null, 7}));
+}
+
+TEST_F(ClientTest, TellsAnUnknownServiceTypeOfASessionThatNobodyHas)
+{
+    EXPECT_EQ(player.call(GetServiceNameForReporterID, 42), answeredOnce({null, 65535}));
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "fetching seviceType"),
+                            IsLine(Error, "kers", "failed to find reporting session 42"),
+                            IsLine(Default, "kerc", "returning service type 65535 for reporter  42")));
+}
+
+TEST_F(ClientTest, AnswersTheServiceTypeOfSessionZeroTwice)
+{
+    EXPECT_EQ(player.call(GetServiceNameForReporterID, 0), (Answers{{null, 65535}, {null, 65535}}));
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "fetching seviceType"),
+                            IsLine(Default, "kerc", "returning service type 65535 for reporter  0")));
+}
+
+TEST_F(ClientTest, AnswersTheServiceTypeOfItsOwnSessionZeroTheSecondTime)
+{
+    create(0);
+    EXPECT_EQ(player.call(GetServiceNameForReporterID, 0), (Answers{{null, 65535}, {null, 0}}));
+    EXPECT_EQ(recorder.call(GetServiceNameForReporterID, 0), (Answers{{null, 65535}, {null, 65535}}))
+        << "nobody else finds it";
+}
+
+// --- set configuration
+
+TEST_F(ClientTest, MergesAConfiguration)
+{
+    create(42);
+    harness.forget();
+    EXPECT_EQ(player.call(SetConfiguration, Dictionary{{"a", 1}, {"b", 2}}, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.call(SetConfiguration, Dictionary{{"a", 3}}, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(42)->configuration(), (Dictionary{{"a", 3}, {"b", 2}}));
+    EXPECT_THAT(
+        lines(),
+        ElementsAre(IsLine(Debug, "kerc", "setting configuration"), IsLine(Debug, "kerc", "setting configuration")));
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+}
+
+TEST_F(ClientTest, ConfiguresSessionZero)
+{
+    create(0);
+    EXPECT_EQ(player.call(SetConfiguration, Dictionary{{"a", 1}}, 0), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(0)->configuration(), (Dictionary{{"a", 1}}));
+}
+
+TEST_F(ClientTest, ConfiguresNoSessionThatItDoesNotHave)
+{
+    recorder.call(CreateReportingSession, 43);
+    EXPECT_EQ(player.call(SetConfiguration, Dictionary{{"a", 1}}, 43), answeredOnce(succeeded));
+    EXPECT_EQ(recorder.session(43)->configuration(), Dictionary());
+}
+
+TEST_F(ClientTest, CannotSendTheTraceTypeConstant)
+{
+    create(42);
+    player.call(SetConfiguration, Dictionary{{"KestoReportingTraceType", KestoReportingTraceTypeKtrace}}, 42);
+    const auto received = player.session(42)->configuration().find("KestoReportingTraceType")->string();
+    EXPECT_EQ(*received, KestoReportingTraceTypeKtrace);
+    EXPECT_FALSE(received->isSameObject(KestoReportingTraceTypeKtrace));
+}
+
+// --- start
+
+TEST_F(ClientTest, StartsASessionAndHoldsTheAnswer)
+{
+    create(42);
+    harness.forget();
+    EXPECT_EQ(start(42), unanswered);
+    EXPECT_TRUE(player.session(42)->started());
+    EXPECT_TRUE(player.session(42)->transactionCompleteBlock());
+    EXPECT_NE(player.session(42)->driverSnapShot(), std::nullopt);
+    EXPECT_EQ(player.connection().unansweredCalls(), once);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "starting session for reporter 42"),
+                            IsLine(Debug, "kerr", "starting session owned by 42"),
+                            IsLine(Default, "kers", "getting features"),
+                            IsLine(Default, "kers", "sessions for client 1001 : [" + described(42, true) + "]"),
+                            IsLine(Default, "kers", "sessions for client 1002 : []"),
+                            IsLine(Default, "kerc", "0 active reporting session(s) [" + described(42, true) + "]")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart, sessionStarted));
+}
+
+TEST_F(ClientTest, AnswersAStartOfASessionThatIsStartedAtOnce)
+{
+    create(42);
+    const auto first = player.submit(StartReportingSessionForID, {42});
+    platform.workQueues.runAll();
+    harness.forget();
+
+    EXPECT_EQ(start(42), answeredOnce(succeeded));
+    EXPECT_EQ(player.answersTo(first), unanswered);
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "starting session for reporter 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart));
+
+    stop(42);
+    EXPECT_EQ(player.answersTo(first), answeredOnce(succeeded)) << "the stored callback was not replaced";
+}
+
+TEST_F(ClientTest, StartsNeitherSessionZeroNorOneThatItDoesNotHave)
+{
+    create(0);
+    recorder.call(CreateReportingSession, 43);
+    harness.forget();
+    for (const std::int64_t reporterID : {0, 43, 44})
+        EXPECT_EQ(start(reporterID), answeredOnce(succeeded));
+    EXPECT_FALSE(player.session(0)->started());
+    EXPECT_FALSE(recorder.session(43)->started());
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "starting session for reporter 0"),
+                            IsLine(Debug, "kerc", "starting session for reporter 43"),
+                            IsLine(Debug, "kerc", "starting session for reporter 44")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart, clientStart, clientStart));
+}
+
+TEST_F(ClientTest, AnswersTheFirstOfTwoStartsAtTheStopBetweenThem)
+{
+    create(42);
+    const auto first = player.submit(StartReportingSessionForID, {42});
+    const auto stopped = player.submit(StopReportingSessionForID, {42});
+    const auto second = player.submit(StartReportingSessionForID, {42});
+    const std::size_t before = player.connection().received().size();
+    platform.workQueues.runAll();
+
+    EXPECT_EQ(player.answersTo(second), unanswered);
+    const auto& received = player.connection().received();
+    EXPECT_THAT(std::vector(received.begin() + static_cast<std::ptrdiff_t>(before), received.end()),
+                ElementsAre(Array{first, null, true}, Array{stopped, null, true}))
+        << "the start is answered first, then the stop";
+    EXPECT_TRUE(player.session(42)->started());
+}
+
+TEST_F(ClientTest, AnswersACallbackThatTheSessionStillHoldsBeforeItStoresTheNext)
+{
+    create(42);
+    int answered = 0;
+    player.session(42)->setTransactionCompleteBlock([&](const auto& error, bool success) {
+        EXPECT_EQ(error, std::nullopt);
+        EXPECT_TRUE(success);
+        ++answered;
+    });
+    EXPECT_EQ(start(42), unanswered);
+    EXPECT_EQ(answered, 1);
+    stop(42);
+    EXPECT_EQ(answered, 1);
+}
+
+TEST_F(ClientTest, TellsAStartedSessionTheFeatureState)
+{
+    platform.preferences.set("com.quarn.kesto", "device_name", "Speaker");
+    create(42);
+    harness.forget();
+    start(42);
+    const auto messages = player.session(42)->nestedAggregatedPayloadData().value();
+    ASSERT_EQ(messages.size(), 1U);
+    const auto payload = messages[0].find("Setup_Setup_1")->dictionary();
+    EXPECT_EQ(*payload->find("device_name"), Value("Speaker"));
+    EXPECT_EQ(*payload->find("audiotag"), Value("SetupSetup"));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart, sessionStarted, sessionMessageAccepted));
+}
+
+TEST_F(ClientTest, TellsAStartedSessionNothingWhenNoFeatureIsKnown)
+{
+    create(42);
+    start(42);
+    EXPECT_THAT(*player.session(42)->nestedAggregatedPayloadData(), IsEmpty());
+}
+
+class TracedStartTest : public ClientTest {
+protected:
+    void makeTestSession(AudioServiceType serviceType)
+    {
+        create(42);
+        player.call(SetServiceType, serviceType, 42);
+    }
+};
+
+TEST_F(TracedStartTest, IsAnsweredAtOnceAndAgainAtTheStop)
+{
+    platform.featureFlags.enable("Sonalis", "Tracing");
+    makeTestSession(11);
+    const auto started = player.submit(StartReportingSessionForID, {42});
+    platform.workQueues.runAll();
+    EXPECT_EQ(player.answersTo(started), answeredOnce(succeeded));
+    stop(42);
+    EXPECT_EQ(player.answersTo(started), (Answers{succeeded, succeeded}));
+}
+
+TEST_F(TracedStartTest, IsHeldForAnotherServiceType)
+{
+    platform.featureFlags.enable("Sonalis", "Tracing");
+    makeTestSession(12);
+    EXPECT_EQ(start(42), unanswered);
+}
+
+TEST_F(TracedStartTest, IsHeldWhenTheFlagIsOff)
+{
+    platform.featureFlags.enable("Sonalis", "tracing");
+    platform.featureFlags.enable("Other", "Tracing");
+    makeTestSession(11);
+    EXPECT_EQ(start(42), unanswered);
+}
+
+// --- stop
+
+TEST_F(ClientTest, StopsASessionAndAnswersItsStart)
+{
+    create(42);
+    const auto started = player.submit(StartReportingSessionForID, {42});
+    platform.workQueues.runAll();
+    harness.forget();
+    EXPECT_EQ(stop(42), answeredOnce(succeeded));
+    EXPECT_EQ(player.answersTo(started), answeredOnce(succeeded));
+    EXPECT_FALSE(player.session(42)->started());
+    EXPECT_FALSE(player.session(42)->transactionCompleteBlock());
+    EXPECT_EQ(player.session(42)->driverSnapShot(), std::nullopt);
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "stopping session for reporter 42"),
+                            IsLine(Debug, "kerr", "ending session 42"), IsLine(Debug, "kerr", "ending session 42"),
+                            IsLine(Default, "kers", "sessions for client 1001 : [" + described(42, false) + "]"),
+                            IsLine(Default, "kers", "sessions for client 1002 : []"),
+                            IsLine(Default, "kerc", "0 active reporting session(s) []"),
+                            IsLine(Default, "kerc", "stopping 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStop, sessionStopping));
+}
+
+TEST_F(ClientTest, AnswersTheStopOfASessionThatIsNotStarted)
+{
+    create(42);
+    harness.forget();
+    EXPECT_EQ(stop(42), answeredOnce(succeeded));
+    EXPECT_THAT(
+        lines(),
+        ElementsAre(IsLine(Debug, "kerc", "stopping session for reporter 42"), IsLine(Default, "kerc", "stopping 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStop));
+}
+
+TEST_F(ClientTest, StopsNoSessionThatItDoesNotHave)
+{
+    recorder.call(CreateReportingSession, 43);
+    recorder.call(StartReportingSessionForID, 43);
+    harness.forget();
+    EXPECT_EQ(stop(43), answeredOnce(succeeded));
+    EXPECT_TRUE(recorder.session(43)->started());
+    EXPECT_THAT(
+        lines(),
+        ElementsAre(IsLine(Debug, "kerc", "stopping session for reporter 43"), IsLine(Default, "kerc", "stopping 43")));
+}
+
+TEST_F(ClientTest, AnswersTheStopOfSessionZeroWithoutAnotherWord)
+{
+    create(0);
+    player.session(0)->start();
+    harness.forget();
+    EXPECT_EQ(stop(0), answeredOnce(succeeded));
+    EXPECT_TRUE(player.session(0)->started());
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "stopping session for reporter 0")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStop));
+}
+
+// --- destroy
+
+TEST_F(ClientTest, DestroysAStartedSessionWithoutAnsweringItsStart)
+{
+    create(42);
+    const auto started = player.submit(StartReportingSessionForID, {42});
+    platform.workQueues.runAll();
+    harness.forget();
+    EXPECT_EQ(player.call(DestroyReportingSession, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(42), nullptr);
+    EXPECT_EQ(player.answersTo(started), unanswered);
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U) << "nobody can answer it any more";
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "destroying session for reporter 42"),
+                            IsLine(Debug, "kerr", "ending session 42"), IsLine(Debug, "kerr", "ending session 42"),
+                            IsLine(Info, "kerr", "deallocing this session 42"),
+                            IsLine(Default, "kerc", "destroying 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientDestroy, sessionStopping, sessionDestroyed));
+}
+
+TEST_F(ClientTest, DestroysASessionThatIsNotStartedWithoutStoppingIt)
+{
+    create(42);
+    harness.forget();
+    EXPECT_EQ(player.call(DestroyReportingSession, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(42), nullptr);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "destroying session for reporter 42"),
+                            IsLine(Info, "kerr", "deallocing this session 42"),
+                            IsLine(Default, "kerc", "destroying 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientDestroy, sessionDestroyed));
+}
+
+TEST_F(ClientTest, DestroysNoSessionThatItDoesNotHave)
+{
+    recorder.call(CreateReportingSession, 43);
+    harness.forget();
+    EXPECT_EQ(player.call(DestroyReportingSession, 43), answeredOnce(succeeded));
+    EXPECT_NE(recorder.session(43), nullptr);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "destroying session for reporter 43"),
+                            IsLine(Default, "kerc", "destroying 43")));
+}
+
+TEST_F(ClientTest, DestroysSessionZeroNeither)
+{
+    create(0);
+    harness.forget();
+    EXPECT_EQ(player.call(DestroyReportingSession, 0), answeredOnce(succeeded));
+    EXPECT_NE(player.session(0), nullptr);
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "destroying session for reporter 0")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientDestroy));
+}
+
+// --- validate and list
+
+TEST_F(ClientTest, ValidatesASessionOfAnyClient)
+{
+    create(42);
+    player.call(SetServiceType, 4, 42);
+    harness.forget();
+    const Array valid{null, Dictionary{{"reporterID", 42}, {"serviceType", 4}}};
+    EXPECT_EQ(player.call(ValidReporterID, 42), answeredOnce(valid));
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "validating reporter 42"),
+                            IsLine(Default, "kerc", "validating reporter 42")));
+    harness.forget();
+    EXPECT_EQ(recorder.call(ValidReporterID, 42), answeredOnce(valid));
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerc", "validating reporter 42"),
+                            IsLine(Info, "kers", "found reporting session 42 for client 1001"),
+                            IsLine(Default, "kerc", "validating reporter 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+}
+
+TEST_F(ClientTest, ValidatesNoSessionThatNobodyHas)
+{
+    const Array invalid{null, Dictionary{{"reporterID", 0}, {"serviceType", 65535}}};
+    EXPECT_EQ(player.call(ValidReporterID, 42), answeredOnce(invalid));
+    EXPECT_EQ(player.call(ValidReporterID, 0), answeredOnce(invalid));
+}
+
+TEST_F(ClientTest, ValidatesItsOwnSessionZero)
+{
+    create(0);
+    EXPECT_EQ(player.call(ValidReporterID, 0), answeredOnce({null, Dictionary{{"reporterID", 0}, {"serviceType", 0}}}));
+}
+
+TEST_F(ClientTest, ListsTheReportersOfAllClientsInOrder)
+{
+    EXPECT_EQ(player.call(GetAllReporters), answeredOnce({null, Array{}}));
+    recorder.call(CreateReportingSession, 5);
+    recorder.call(CreateReportingSession, -3);
+    create(9);
+    create(5);
+    create(0);
+    create(9);
+    harness.forget();
+    EXPECT_EQ(recorder.call(GetAllReporters), answeredOnce({null, Array{9, 5, 0, 5, -3}}));
+    EXPECT_THAT(lines(), IsEmpty());
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+}
+
+// --- kill
+
+class ClientDeathTest : public ClientTest {
+protected:
+    void killAloud()
+    {
+        platform.log.setObserver([](const LogLine& line) {
+            std::cerr << platform::name(line.level) << ' ' << line.tag << ' ' << line.message;
+        });
+        player.submit(KillService, {});
+    }
+};
+
+TEST_F(ClientDeathTest, EndsTheProcessOnTheCallersThreadWithStatusTwo)
+{
+    EXPECT_EXIT(killAloud(), testing::ExitedWithCode(2), "^default kerc DESTROYING SERVICE$");
+}
+
+// --- connection loss
+
+TEST_F(ClientTest, StopsItsStartedSessionsInOrderAndLeavesWhenTheConnectionIsLost)
+{
+    for (const std::int64_t reporterID : {3, 1, 2})
+        create(reporterID);
+    start(2);
+    start(3);
+    harness.forget();
+    player.object()->handleConnectionError();
+    platform.workQueues.runAll();
+
+    EXPECT_EQ(player.object()->clientReportingSessionMap().size(), 0U);
+    EXPECT_THAT(harness.service->getAllClients(), ElementsAre(recorder.object()));
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerr", "ending session 3"), IsLine(Debug, "kerr", "ending session 3"),
+                            IsLine(Debug, "kerr", "ending session 2"), IsLine(Debug, "kerr", "ending session 2"),
+                            IsLine(Info, "kerr", "deallocing this session 3"),
+                            IsLine(Info, "kerr", "deallocing this session 1"),
+                            IsLine(Info, "kerr", "deallocing this session 2"),
+                            IsLine(Default, "kerc", "removing 1001 from the server client list")));
+    EXPECT_THAT(platform.traceMarkers.take(),
+                ElementsAre(sessionStopping, sessionStopping, sessionDestroyed, sessionDestroyed, sessionDestroyed));
+}
+
+TEST_F(ClientTest, DoesNothingWhenItsConnectionIsLostAgain)
+{
+    player.object()->handleConnectionError();
+    platform.workQueues.runAll();
+    harness.forget();
+    player.object()->handleConnectionError();
+    platform.workQueues.runAll();
+    EXPECT_THAT(lines(), IsEmpty());
+    EXPECT_THAT(harness.service->getAllClients(), ElementsAre(recorder.object()));
+}
+
+TEST_F(ClientTest, NeverAnswersAStartWhoseConnectionWasLost)
+{
+    create(42);
+    const auto started = player.submit(StartReportingSessionForID, {42});
+    platform.workQueues.runAll();
+    player.object()->handleConnectionError();
+    platform.workQueues.runAll();
+    EXPECT_EQ(player.answersTo(started), unanswered);
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U);
+}
+
+TEST_F(ClientTest, IsNotFoundAnyMoreOnceItIsGone)
+{
+    create(42);
+    player.close();
+    EXPECT_EQ(recorder.call(GetServiceNameForReporterID, 42), answeredOnce({null, 65535}));
+    EXPECT_EQ(player.object(), nullptr);
+}
+
+TEST_F(ClientTest, CarriesOutTheCallsThatCameBeforeItsEnd)
+{
+    player.submit(CreateReportingSession, {42});
+    player.submit(StartReportingSessionForID, {42});
+    player.close();
+    EXPECT_THAT(platform.log.lines("kerr"), testing::Contains(IsLine(Debug, "kerr", "starting session owned by 42")));
+    EXPECT_THAT(platform.log.lines("kerr"), testing::Contains(IsLine(Debug, "kerr", "ending session 42")).Times(2));
+    EXPECT_EQ(player.object(), nullptr);
+}
+
+TEST_F(ClientTest, DoesNothingFurtherOnceTheServiceIsGone)
+{
+    const auto orphan = std::make_shared<KestoReportingClientServerInstance>(
+        17, std::weak_ptr<KestoReportingServiceDelegateProtocol>());
+    harness.forget();
+    orphan->createReportingSession(42, [](const auto&, bool) { });
+    orphan->startReportingSessionForID(42, [](const auto&, bool) { });
+    orphan->handleConnectionError();
+    platform.workQueues.runAll();
+    EXPECT_FALSE(orphan->clientReportingSessionMap().find(42)->started());
+    EXPECT_THAT(platform.log.lines("kers"), IsEmpty());
+}
+
+} // namespace

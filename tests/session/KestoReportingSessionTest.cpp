@@ -1,0 +1,370 @@
+// A session's life: what it is made with, how its configuration grows, and how a run begins and ends.
+#include "session/KestoReportingSession.h"
+#include "foundation/Cbor.h"
+#include "support/TestPlatform.h"
+
+#include <gmock/gmock.h>
+#include <limits>
+
+namespace {
+
+using enum platform::LogLevel;
+using foundation::Dictionary;
+using foundation::Value;
+using support::IsLine;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+constexpr std::uint32_t created = 0x21044828;
+constexpr std::uint32_t started = 0x2104482C;
+constexpr std::uint32_t stopping = 0x21044830;
+constexpr std::uint32_t destroyed = 0x21044834;
+constexpr std::uint32_t accepted = 0x21044838;
+
+class SessionTest : public testing::Test {
+protected:
+    void forget()
+    {
+        platform.log.clear();
+        platform.traceMarkers.take();
+    }
+
+    support::TestPlatform platform;
+    std::shared_ptr<KestoReportingSession> session =
+        std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7, 8});
+};
+
+// --- making and letting go
+
+TEST_F(SessionTest, IsMadeWithItsIdentityAndNothingElse)
+{
+    EXPECT_EQ(session->reporterID(), 42);
+    EXPECT_THAT(session->processIdentifiers(), ElementsAre(7, 8));
+    EXPECT_FALSE(session->started());
+    EXPECT_FALSE(session->blinReportingEnabled());
+    EXPECT_EQ(session->serviceType(), 0);
+    EXPECT_EQ(session->serviceName(), "");
+    EXPECT_EQ(session->configuration(), Dictionary());
+    EXPECT_EQ(session->driverSnapShot(), std::nullopt);
+    EXPECT_FALSE(session->transactionCompleteBlock());
+    EXPECT_EQ(session->nestedAggregatedPayloadData(), std::nullopt);
+    EXPECT_EQ(session->messageIdentifierCounts(), std::nullopt);
+}
+
+TEST_F(SessionTest, SaysAndMarksThatItWasMade)
+{
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "created reporting session for ID: 42")));
+    EXPECT_EQ(platform.log.lines()[0].file, "KestoReportingSession");
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(created));
+}
+
+TEST_F(SessionTest, SaysAndMarksThatItGoes)
+{
+    forget();
+    session.reset();
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "deallocing this session 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));
+}
+
+TEST_F(SessionTest, GoesWithoutStoppingWhenItIsLetGoOfWhileStarted)
+{
+    session->start();
+    forget();
+    session.reset();
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "deallocing this session 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));
+}
+
+TEST_F(SessionTest, TakesAnyNumberForItsIdentity)
+{
+    for (const std::int64_t reporterID :
+         {std::int64_t{0}, std::int64_t{-1}, std::numeric_limits<std::int64_t>::min()}) {
+        platform.log.clear();
+        const KestoReportingSession other(reporterID, {});
+        EXPECT_EQ(other.reporterID(), reporterID);
+        EXPECT_THAT(
+            platform.log.lines(),
+            ElementsAre(IsLine(Info, "kerr", "created reporting session for ID: " + std::to_string(reporterID))));
+    }
+}
+
+TEST_F(SessionTest, AnswersThreeQueriesAlwaysTheSame)
+{
+    EXPECT_EQ(session->getBlinReportingStartedState(), std::nullopt);
+    EXPECT_EQ(session->getPTTraceFileURL(), std::nullopt);
+    EXPECT_FALSE(session->shouldReportOrientation());
+}
+
+TEST_F(SessionTest, HoldsWhatItsClientInstanceKeepsInIt)
+{
+    session->setBlinReportingEnabled(true);
+    EXPECT_TRUE(session->blinReportingEnabled());
+
+    int calls = 0;
+    session->setTransactionCompleteBlock([&](const auto&, bool) { ++calls; });
+    session->start();
+    session->stop();
+    EXPECT_EQ(calls, 0) << "the session itself never calls it";
+    session->transactionCompleteBlock()(std::nullopt, true);
+    EXPECT_EQ(calls, 1);
+    session->setTransactionCompleteBlock(nullptr);
+    EXPECT_FALSE(session->transactionCompleteBlock());
+
+    session->setDriverSnapShot(KestoReportingDriverSnapShot{{"Rx-(null)", {}}});
+    EXPECT_THAT(*session->driverSnapShot(), SizeIs(1));
+    session->setDriverSnapShot(std::nullopt);
+    EXPECT_EQ(session->driverSnapShot(), std::nullopt);
+}
+
+// --- description
+
+TEST_F(SessionTest, DescribesItself)
+{
+    session->setServiceType(7);
+    session->setConfiguration(Dictionary{{"HostApplicationDisplayID", "org.player"}});
+    session->start();
+    EXPECT_EQ(session->description(),
+              "reporterID=42,serviceName=longformaudio,ownerPid=7,HostApplicationDisplayID=org.player,started=1");
+}
+
+TEST_F(SessionTest, DescribesWhatItDoesNotKnow)
+{
+    EXPECT_EQ(session->description(),
+              "reporterID=42,serviceName=(null),ownerPid=7,HostApplicationDisplayID=Unknown,started=0");
+    EXPECT_EQ(KestoReportingSession(-1, {}).description(),
+              "reporterID=-1,serviceName=(null),ownerPid=0,HostApplicationDisplayID=Unknown,started=0");
+}
+
+// --- service type
+
+TEST_F(SessionTest, TakesANameFromItsServiceTypeAndSaysSo)
+{
+    forget();
+    session->setServiceType(3);
+    EXPECT_EQ(session->serviceType(), 3);
+    EXPECT_EQ(session->serviceName(), "haptics");
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "setting service type haptics")));
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+}
+
+TEST_F(SessionTest, KeepsTheNumberOfAServiceTypeItHasNoNameFor)
+{
+    session->setServiceType(14);
+    EXPECT_EQ(session->serviceType(), 14);
+    EXPECT_EQ(session->serviceName(), "telephony");
+    session->setServiceType(65535);
+    EXPECT_EQ(session->serviceName(), "unknown");
+}
+
+TEST_F(SessionTest, TakesAServiceTypeWhileStartedToo)
+{
+    session->start();
+    session->setServiceType(4);
+    EXPECT_EQ(session->serviceName(), "alarms");
+    EXPECT_TRUE(session->started());
+}
+
+// --- configuration
+
+TEST_F(SessionTest, MergesConfigurations)
+{
+    session->setConfiguration(Dictionary{{"a", 1}});
+    session->setConfiguration(Dictionary{{"b", 2}});
+    session->setConfiguration(Dictionary{{"a", 3}});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", 3}, {"b", 2}}));
+}
+
+TEST_F(SessionTest, MergesTheContentsOfConfigurationsInTheSameWay)
+{
+    session->updateConfigurationWithContentsOfConfiguration(Dictionary{{"a", 1}});
+    session->updateConfigurationWithContentsOfConfiguration(Dictionary{{"b", 2}});
+    session->updateConfigurationWithContentsOfConfiguration(Dictionary{{"a", 3}});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", 3}, {"b", 2}}));
+}
+
+TEST_F(SessionTest, MergesDictionariesWithinAsWholes)
+{
+    session->setConfiguration(Dictionary{{"inner", Dictionary{{"a", 1}}}});
+    session->setConfiguration(Dictionary{{"inner", Dictionary{{"b", 2}}}});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"inner", Dictionary{{"b", 2}}}}));
+}
+
+TEST_F(SessionTest, IsNotChangedByNoConfiguration)
+{
+    session->setConfiguration(Dictionary{{"a", 1}});
+    session->setConfiguration(std::nullopt);
+    session->updateConfigurationWithContentsOfConfiguration(std::nullopt);
+    session->updateConfigurationWithContentsOfConfiguration(Dictionary{});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", 1}}));
+}
+
+TEST_F(SessionTest, KeepsItsConfigurationAndServiceTypeOverRuns)
+{
+    session->setServiceType(4);
+    session->setConfiguration(Dictionary{{"a", 1}});
+    session->start();
+    session->updateConfigurationWithContentsOfConfiguration(Dictionary{{"b", 2}});
+    session->stop();
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", 1}, {"b", 2}}));
+    EXPECT_EQ(session->serviceType(), 4);
+    EXPECT_EQ(session->serviceName(), "alarms");
+}
+
+TEST_F(SessionTest, LetsNoConfigurationOutgrowItsLimit)
+{
+    const std::string half(KestoReportingSession::largestConfiguration / 2, 'x');
+    session->setConfiguration(Dictionary{{"a", half}});
+    forget();
+    session->setConfiguration(Dictionary{{"b", half}});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", half}}));
+    EXPECT_THAT(
+        platform.log.lines(),
+        ElementsAre(IsLine(Error, "kerr",
+                           "configuration of session 42 would take more than 1048576 bytes; the change is ignored")));
+    session->setConfiguration(Dictionary{{"a", 1}});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", 1}}));
+}
+
+// --- the trace type that only in-process code can hand in
+
+TEST_F(SessionTest, TellsTheTraceTypeConstantFromEqualText)
+{
+    EXPECT_EQ(KestoReportingTraceTypeKtrace, std::string_view("ktrace"));
+    session->setConfiguration(Dictionary{{"KestoReportingTraceType", KestoReportingTraceTypeKtrace}});
+    EXPECT_TRUE(session->configuration()
+                    .find("KestoReportingTraceType")
+                    ->string()
+                    ->isSameObject(KestoReportingTraceTypeKtrace));
+    session->setConfiguration(Dictionary{{"KestoReportingTraceType", "ktrace"}});
+    EXPECT_FALSE(session->configuration()
+                     .find("KestoReportingTraceType")
+                     ->string()
+                     ->isSameObject(KestoReportingTraceTypeKtrace));
+}
+
+TEST(TraceTypeConstant, IsNeverWhatAClientSends)
+{
+    std::string wire;
+    foundation::appendCbor(Dictionary{{"KestoReportingTraceType", KestoReportingTraceTypeKtrace}}, wire);
+    foundation::CborDecoder decoder;
+    const auto received = decoder.decode(wire)->dictionary()->find("KestoReportingTraceType")->string();
+    EXPECT_EQ(*received, KestoReportingTraceTypeKtrace);
+    EXPECT_FALSE(received->isSameObject(KestoReportingTraceTypeKtrace));
+}
+
+// --- start and stop
+
+TEST_F(SessionTest, BeginsARunWithAnEmptyStore)
+{
+    forget();
+    session->start();
+    EXPECT_TRUE(session->started());
+    EXPECT_THAT(*session->nestedAggregatedPayloadData(), IsEmpty());
+    EXPECT_EQ(session->messageIdentifierCounts(), Dictionary());
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(started));
+}
+
+TEST_F(SessionTest, StartedTwiceGoesOnAsItIs)
+{
+    session->start();
+    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    forget();
+    session->start();
+    EXPECT_TRUE(session->started());
+    EXPECT_THAT(*session->nestedAggregatedPayloadData(), SizeIs(1));
+    EXPECT_EQ(session->messageIdentifierCounts(), (Dictionary{{"Playback_Start", 1}}));
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42"),
+                            IsLine(Info, "kerr", "42 is already started")));
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+}
+
+TEST_F(SessionTest, EndsARunAndDropsWhatItRecorded)
+{
+    session->start();
+    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    forget();
+    session->stop();
+    EXPECT_FALSE(session->started());
+    EXPECT_EQ(session->nestedAggregatedPayloadData(), std::nullopt);
+    EXPECT_EQ(session->messageIdentifierCounts(), std::nullopt);
+    const auto lines = platform.log.lines();
+    ASSERT_THAT(lines, SizeIs(testing::Ge(2U)));
+    EXPECT_THAT(lines[0], IsLine(Debug, "kerr", "ending session 42"));
+    EXPECT_THAT(lines[1], IsLine(Debug, "kerr", "ending session 42"));
+    EXPECT_EQ(platform.traceMarkers.take().front(), stopping);
+}
+
+TEST_F(SessionTest, StoppedWithoutAStartOnlySaysSo)
+{
+    forget();
+    platform.analytics.use("*");
+    session->stop();
+    session->start();
+    session->stop();
+    forget();
+    platform.analytics.clear();
+    session->stop();
+    EXPECT_FALSE(session->started());
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "ending session 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.analytics.sent(), IsEmpty());
+    EXPECT_THAT(platform.fileSystem.files, IsEmpty());
+}
+
+TEST_F(SessionTest, BeginsEveryKindAnewInTheNextRun)
+{
+    session->start();
+    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    session->sendMessage(Dictionary{{"a", 2}}, 4, 1, nullptr);
+    session->stop();
+    session->start();
+    session->sendMessage(Dictionary{{"a", 2}}, 4, 1, nullptr);
+    const auto messages = *session->nestedAggregatedPayloadData();
+    ASSERT_THAT(messages, SizeIs(1));
+    EXPECT_TRUE(messages[0].contains("Playback_Start_1"));
+}
+
+TEST_F(SessionTest, MarksEveryPointOfItsLifeInOrder)
+{
+    session->setServiceType(4);
+    session->start();
+    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(created, started, accepted));
+    session->stop();
+    EXPECT_EQ(platform.traceMarkers.take().front(), stopping);
+    session.reset();
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));
+}
+
+class UntracedSessionTest : public SessionTest,
+                            public testing::WithParamInterface<std::tuple<AudioServiceType, bool, Dictionary>> { };
+
+TEST_P(UntracedSessionTest, TracesNothing)
+{
+    const auto& [serviceType, isTracingOn, configuration] = GetParam();
+    if (isTracingOn)
+        platform.featureFlags.enable("Sonalis", "Tracing");
+    session->setServiceType(serviceType);
+    session->setConfiguration(configuration);
+    forget();
+    session->start();
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42")));
+    EXPECT_THAT(platform.kernelTrace.sessions(), IsEmpty());
+}
+
+constexpr AudioServiceType serviceTypeTest = 11;
+const Dictionary wholeConfiguration{{"KestoReportingPellorinPlistFilePath", "/traces.plist"}};
+
+INSTANTIATE_TEST_SUITE_P(
+    WithoutOneOfTheConditions, UntracedSessionTest,
+    testing::Values(std::tuple(serviceTypeTest, false, wholeConfiguration), // the flag is off
+                    std::tuple(AudioServiceType{0}, true, wholeConfiguration), // another service type
+                    std::tuple(AudioServiceType{12}, true, wholeConfiguration),
+                    std::tuple(serviceTypeTest, true, wholeConfiguration.with("KestoReportingTraceType", "ktrace")),
+                    std::tuple(serviceTypeTest, true, wholeConfiguration.with("KestoReportingTraceType", 1)),
+                    std::tuple(serviceTypeTest, true, Dictionary{}))); // no file
+
+} // namespace

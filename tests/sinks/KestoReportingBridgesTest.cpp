@@ -1,0 +1,185 @@
+// What leaves the device, and under which names.
+#include "sinks/KestoReportingFennicBridge.h"
+#include "sinks/KestoReportingGimboUtility.h"
+#include "sinks/KestoReportingTrelmBridge.h"
+#include "support/TestPlatform.h"
+
+#include <gmock/gmock.h>
+
+namespace {
+
+using foundation::Dictionary;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class SinkSession final : public KestoReportingSinkSession {
+public:
+    [[nodiscard]] AudioServiceType serviceType() const override { return type; }
+    [[nodiscard]] Dictionary configuration() const override { return settings; }
+
+    AudioServiceType type = 2;
+    Dictionary settings;
+};
+
+class FennicBridgeTest : public testing::Test {
+protected:
+    void send(const Dictionary& message, AudioEventCategory category = 4, AudioEventType type = 1)
+    {
+        KestoReportingFennicBridge::handleEvent(message, category, type, session);
+    }
+
+    support::TestPlatform platform;
+    std::shared_ptr<SinkSession> session = std::make_shared<SinkSession>();
+};
+
+TEST_F(FennicBridgeTest, OffersAnEventForAllServicesAndThenOneForTheSessionsOwn)
+{
+    platform.analytics.use("*");
+    send({});
+    EXPECT_THAT(platform.analytics.asked(),
+                ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.telephony.Playback.Start"));
+    EXPECT_THAT(platform.analytics.sent(),
+                ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.telephony.Playback.Start"));
+}
+
+TEST_F(FennicBridgeTest, NamesEventsByCategoryTypeAndService)
+{
+    platform.analytics.use("*");
+    send({}, 7, 6);
+    EXPECT_THAT(platform.analytics.sent(), ElementsAre("com.quarn.kesto.IO.Error", "com.quarn.telephony.IO.Error"));
+}
+
+TEST_F(FennicBridgeTest, NamesTheGroupOfACategory)
+{
+    platform.analytics.use("*");
+    send({}, 0x10000004, 1);
+    EXPECT_THAT(platform.analytics.sent(),
+                ElementsAre("com.quarn.kesto.DSP_Playback.Start", "com.quarn.telephony.DSP_Playback.Start"));
+}
+
+TEST_F(FennicBridgeTest, NamesWhatItDoesNotKnow)
+{
+    platform.analytics.use("*");
+    session->type = 65535;
+    send({}, 0xFFFFFFFF, 65535);
+    session->type = 14;
+    send({}, 0, 0);
+    EXPECT_THAT(platform.analytics.sent(),
+                ElementsAre("com.quarn.kesto.Undefined.Unknown", "com.quarn.unknown.Undefined.Unknown",
+                            "com.quarn.kesto.Undefined.Generic", "com.quarn.telephony.Undefined.Generic"));
+}
+
+TEST_F(FennicBridgeTest, SendsEachNameOnlyWhenItIsWanted)
+{
+    platform.analytics.use("com.quarn.kesto.*");
+    send({{"a", 1}});
+    EXPECT_THAT(platform.analytics.sent(), ElementsAre("com.quarn.kesto.Playback.Start"));
+
+    platform.analytics.use("com.quarn.alarms.*");
+    platform.analytics.clear();
+    session->type = 4;
+    send({{"a", 1}}, 14, 11);
+    EXPECT_THAT(platform.analytics.sent(),
+                ElementsAre("com.quarn.kesto.Volume.Summary", "com.quarn.alarms.Volume.Summary"));
+}
+
+TEST_F(FennicBridgeTest, SendsTheServicesNameAloneWhenOnlyThatIsWanted)
+{
+    platform.analytics.use("com.quarn.telephony.*");
+    send({});
+    EXPECT_THAT(platform.analytics.asked(),
+                ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.telephony.Playback.Start"));
+    EXPECT_THAT(platform.analytics.sent(), ElementsAre("com.quarn.telephony.Playback.Start"));
+}
+
+TEST_F(FennicBridgeTest, BuildsNothingWhenNeitherNameIsWanted)
+{
+    send({{"a", 1}});
+    EXPECT_THAT(platform.analytics.sent(), IsEmpty());
+    EXPECT_EQ(session.use_count(), 1) << "nobody holds the session for a payload that nobody needs";
+}
+
+TEST_F(FennicBridgeTest, BuildsNoPayloadBeforeItIsNeeded)
+{
+    platform.analytics.use("*");
+    send({{"a", 1}});
+    EXPECT_EQ(platform.analytics.timesBuilt(), 0);
+    EXPECT_GT(session.use_count(), 1);
+}
+
+TEST_F(FennicBridgeTest, AddsTheApplicationOfTheSessionsConfiguration)
+{
+    platform.analytics.use("*");
+    session->settings = {{"HostApplicationDisplayID", "org.player"}};
+    send({{"a", 1}});
+    const Dictionary expected{{"a", 1}, {"HostApplicationDisplayID", "org.player"}};
+    EXPECT_THAT(platform.analytics.events(),
+                ElementsAre(support::AnalyticsEvent{"com.quarn.kesto.Playback.Start", expected},
+                            support::AnalyticsEvent{"com.quarn.telephony.Playback.Start", expected}));
+}
+
+TEST_F(FennicBridgeTest, AddsUnknownWhereTheConfigurationNamesNoApplication)
+{
+    platform.analytics.use("com.quarn.kesto.*");
+    send({});
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Playback.Start"),
+                ElementsAre(Dictionary{{"HostApplicationDisplayID", "Unknown"}}));
+}
+
+TEST_F(FennicBridgeTest, NeverOverwritesTheApplicationOfAPayload)
+{
+    platform.analytics.use("com.quarn.kesto.*");
+    session->settings = {{"HostApplicationDisplayID", "org.player"}};
+    const Dictionary message{{"HostApplicationDisplayID", "org.other"}};
+    send(message);
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Playback.Start"), ElementsAre(message));
+}
+
+TEST_F(FennicBridgeTest, PassesThePayloadOnAsItCame)
+{
+    platform.analytics.use("com.quarn.kesto.*");
+    send({{"a key", 1}, {"kestoreporting_timestamp", 2.5}});
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Playback.Start"),
+                ElementsAre(Dictionary{
+                    {"a key", 1}, {"kestoreporting_timestamp", 2.5}, {"HostApplicationDisplayID", "Unknown"}}));
+}
+
+TEST_F(FennicBridgeTest, ReadsTheConfigurationWhenThePayloadIsBuilt)
+{
+    platform.analytics.use("com.quarn.kesto.*");
+    send({});
+    session->settings = {{"HostApplicationDisplayID", "org.player"}};
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Playback.Start"),
+                ElementsAre(Dictionary{{"HostApplicationDisplayID", "org.player"}}));
+}
+
+TEST_F(FennicBridgeTest, HoldsTheSessionNoLongerThanItsPayload)
+{
+    platform.analytics.use("*");
+    send({});
+    platform.analytics.clear();
+    EXPECT_EQ(session.use_count(), 1);
+}
+
+TEST_F(FennicBridgeTest, LogsNothing)
+{
+    platform.analytics.use("*");
+    send({{"a", 1}});
+    EXPECT_THAT(platform.log.lines(), IsEmpty());
+}
+
+class SilentSinksTest : public FennicBridgeTest { };
+
+TEST_F(SilentSinksTest, AcceptEveryMessageAndDoNothing)
+{
+    platform.analytics.use("*");
+    KestoReportingGimboUtility::handleEvent({{"a", 1}}, 4, 8, session);
+    KestoReportingTrelmBridge::handleEvent({{"a", 1}}, 4, 1, session);
+    EXPECT_THAT(platform.analytics.asked(), IsEmpty());
+    EXPECT_THAT(platform.analytics.sent(), IsEmpty());
+    EXPECT_THAT(platform.log.lines(), IsEmpty());
+    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_EQ(session.use_count(), 1);
+}
+
+} // namespace

@@ -1,0 +1,102 @@
+// Waiting for a flag that another thread sets. The only tests of this folder that take real time, and as little
+// of it as they can: they wait for threads, never for a while.
+#include "support/TestPlatform.h"
+#include "utility/KestoReportingUtility.h"
+
+#include <chrono>
+#include <future>
+#include <gmock/gmock.h>
+#include <thread>
+
+namespace {
+
+using enum platform::LogLevel;
+using support::IsLine;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+constexpr double aMinute = 60;
+constexpr double aMoment = 0.001;
+
+class WaitTest : public testing::Test {
+protected:
+    bool wait(double timeout)
+    {
+        return KestoReportingUtilityWait(condition, timeout, flag, "waiting for it", "it never came",
+                                         KestoReportingTraceCategory());
+    }
+
+    // Returns once the other thread says that it waits, and holds the lock no more: it sleeps then.
+    void letItFallAsleep()
+    {
+        while (platform.log.lines().empty())
+            std::this_thread::yield();
+        const foundation::Lock lock(condition.lock);
+    }
+
+    support::TestPlatform platform;
+    KestoReportingCondition condition;
+    bool flag = false;
+};
+
+TEST_F(WaitTest, ReturnsAtOnceWithoutAWordWhenTheFlagIsSet)
+{
+    flag = true;
+    EXPECT_TRUE(wait(0));
+    EXPECT_THAT(platform.log.lines(), IsEmpty());
+}
+
+TEST_F(WaitTest, GivesUpAfterOneTimeoutWhenNobodySignals)
+{
+    const auto begun = std::chrono::steady_clock::now();
+    EXPECT_FALSE(wait(aMoment));
+    EXPECT_GE(std::chrono::steady_clock::now() - begun, std::chrono::milliseconds(1));
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Info, "kert", "waiting for it"), IsLine(Error, "kert", "it never came")));
+}
+
+TEST_F(WaitTest, ReleasesTheLockWhenItGivesUp)
+{
+    EXPECT_FALSE(wait(aMoment));
+    KestoReportingUtilitySignal(condition, flag); // would block for ever otherwise
+    EXPECT_TRUE(wait(0));
+}
+
+TEST_F(WaitTest, GoesOnWhenItIsSignalled)
+{
+    auto waited = std::async(std::launch::async, [this] { return wait(aMinute); });
+    letItFallAsleep();
+    KestoReportingUtilitySignal(condition, flag);
+    EXPECT_TRUE(waited.get());
+    EXPECT_TRUE(flag);
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Info, "kert", "waiting for it"), IsLine(Info, "kert", "continuing")));
+}
+
+TEST_F(WaitTest, BeginsAnewAfterAWakeUpWithoutTheFlag)
+{
+    auto waited = std::async(std::launch::async, [this] { return wait(aMinute); });
+    letItFallAsleep();
+    while (platform.log.lines().size() < 3) { // "waiting for it", "continuing", "waiting for it"
+        condition.signal.notify_one();
+        std::this_thread::yield();
+    }
+    KestoReportingUtilitySignal(condition, flag);
+    EXPECT_TRUE(waited.get());
+
+    const auto lines = platform.log.lines();
+    ASSERT_EQ(lines.size() % 2, 0U);
+    for (std::size_t place = 0; place < lines.size(); place += 2) {
+        EXPECT_THAT(lines[place], IsLine(Info, "kert", "waiting for it"));
+        EXPECT_THAT(lines[place + 1], IsLine(Info, "kert", "continuing"));
+    }
+}
+
+TEST_F(WaitTest, FindsTheFlagOfASignalThatCameBefore)
+{
+    KestoReportingUtilitySignal(condition, flag);
+    EXPECT_TRUE(wait(aMinute));
+    EXPECT_THAT(platform.log.lines(), IsEmpty());
+}
+
+} // namespace
