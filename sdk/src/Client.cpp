@@ -4,7 +4,6 @@
 #include <cerrno>
 #include <csignal>
 #include <new>
-#include <pthread.h>
 #include <string>
 #include <sys/eventfd.h>
 #include <system_error>
@@ -35,8 +34,6 @@ private:
 };
 
 } // namespace
-
-constinit thread_local const kesto_client* kesto_client::current_ = nullptr;
 
 std::unique_ptr<kesto_client> kesto_client::create(Settings settings)
 {
@@ -69,7 +66,7 @@ try {
 
 void kesto_client::run() noexcept
 {
-    current_ = this;
+    self_.store(pthread_self());
     pthread_setname_np(pthread_self(), "libkesto");
     courier_.run();
     if (freesItself_)
@@ -113,8 +110,12 @@ kesto_status kesto_client::call(CallHead head) noexcept
     libkesto::Callback callback(head.callback); // released here unless it is handed over
     if (const kesto_status status = refusal(); status != KESTO_OK)
         return status;
-    if (!mailbox_.putCall(head))
+    if (courier_.isTellingState() && isOwnThread()) {
+        if (const kesto_status status = courier_.putFirst(head, {}, {}); status != KESTO_OK)
+            return status;
+    } else if (!mailbox_.putCall(head)) {
         return KESTO_QUEUE_FULL;
+    }
     callback.handOver();
     return KESTO_OK;
 }
@@ -163,9 +164,13 @@ kesto_status kesto_client::send(const libkesto::MessageEncoder& message, CallHea
     }
     head.entryCount = message.entryCount();
     head.reporterCount = static_cast<std::uint32_t>(reporters.size());
-    if (!mailbox_.putMessage(head, bytesOf(reporters), message.entries())) {
+    if (courier_.isTellingState() && isOwnThread())
+        status = courier_.putFirst(head, bytesOf(reporters), message.entries());
+    else if (!mailbox_.putMessage(head, bytesOf(reporters), message.entries()))
+        status = KESTO_QUEUE_FULL;
+    if (status != KESTO_OK) {
         ++counters_.droppedQueueFull;
-        return KESTO_QUEUE_FULL;
+        return status;
     }
     ++counters_.queued;
     callback.handOver();

@@ -12,6 +12,7 @@
 #include <atomic>
 #include <chrono>
 #include <memory>
+#include <pthread.h>
 #include <span>
 #include <sys/types.h>
 #include <thread>
@@ -49,10 +50,9 @@ private:
     [[nodiscard]] kesto_status refusal() const noexcept;
     [[nodiscard]] bool fits(std::size_t entryBytes, std::size_t reporterCount) const noexcept;
     [[nodiscard]] kesto_status waitForAnswers(std::chrono::milliseconds timeout) noexcept;
-    [[nodiscard]] bool isOwnThread() const noexcept { return current_ == this; }
+    // Not by a thread-local variable: the first look at one may allocate.
+    [[nodiscard]] bool isOwnThread() const noexcept { return pthread_equal(pthread_self(), self_.load()) != 0; }
     void run() noexcept;
-
-    static thread_local const kesto_client* current_; // whose thread this is
 
     const pid_t process_; // that made it: a child that was forked off has no such thread
     libkesto::Counters counters_;
@@ -63,4 +63,5 @@ private:
     bool freesItself_ = false; // at its thread's end; the thread's
     foundation::Mutex joining_;
     std::thread thread_ KESTO_GUARDED_BY(joining_);
+    std::atomic<pthread_t> self_{}; // of the client's thread, set by it
 };

@@ -27,7 +27,7 @@ Courier::Courier(Settings settings, Mailbox& mailbox, Flushes& flushes, Counters
 
 Courier::~Courier()
 {
-    loseMailbox(KESTO_CLOSED);
+    loseWaitingCalls(KESTO_CLOSED);
 }
 
 void Courier::stop() noexcept
@@ -48,7 +48,7 @@ void Courier::run() noexcept
     connection_.close();
     state_.store(KESTO_STATE_CLOSED);
     calls_.endAll(KESTO_CLOSED);
-    loseMailbox(KESTO_CLOSED);
+    loseWaitingCalls(KESTO_CLOSED);
     changeState(KESTO_STATE_CLOSED);
     flushes_.close();
 }
@@ -82,14 +82,14 @@ void Courier::disconnect(ConnectionFailure failure)
     state_.store(KESTO_STATE_DISCONNECTED); // from here on calls are refused
     startedReporters_.clear();
     calls_.endAll(KESTO_CONNECTION_LOST);
-    loseMailbox(KESTO_CONNECTION_LOST);
+    loseWaitingCalls(KESTO_CONNECTION_LOST);
     flushes_.endAll(KESTO_CONNECTION_LOST);
     changeState(KESTO_STATE_DISCONNECTED, failure);
 }
 
 void Courier::pauseBeforeRetry()
 {
-    loseMailbox(KESTO_CONNECTION_LOST); // what was given in the moment of the change
+    loseWaitingCalls(KESTO_CONNECTION_LOST); // what was given in the moment of the change
     flushes_.endAll(KESTO_NOT_CONNECTED);
     static_cast<void>(wait());
     if (retryAt_ && Clock::now() >= *retryAt_)
@@ -127,7 +127,7 @@ bool Courier::canTakeCalls() const noexcept
 void Courier::takeCalls()
 {
     while (canTakeCalls()) {
-        const auto record = mailbox_.front();
+        const auto record = nextRecord();
         if (!record)
             return;
         readCall(*record, call_);
@@ -136,9 +136,38 @@ void Courier::takeCalls()
         calls_.add(lastCall_ + 1, call_.head);
         ++lastCall_;
         delete call_.head.entries;
-        mailbox_.popFront();
+        popRecord();
         pause_ = shortestPause;
     }
+}
+
+std::optional<std::string_view> Courier::nextRecord() noexcept
+{
+    return firstCalls_.empty() ? mailbox_.front() : firstCalls_.front();
+}
+
+void Courier::popRecord() noexcept
+{
+    if (firstCalls_.empty())
+        return mailbox_.popFront();
+    firstCallsBytes_ -= firstCalls_.front().size();
+    firstCalls_.pop_front();
+}
+
+kesto_status Courier::putFirst(const CallHead& head, std::string_view reporters, std::string_view entries) noexcept
+{
+    const std::size_t size = sizeof head + reporters.size() + entries.size();
+    if (firstCallsBytes_ + size > settings_.queueBytes)
+        return KESTO_QUEUE_FULL;
+    try {
+        std::string record(bytesOf(head));
+        record.append(reporters).append(entries);
+        firstCalls_.push_back(std::move(record));
+    } catch (const std::bad_alloc&) {
+        return KESTO_OUT_OF_MEMORY;
+    }
+    firstCallsBytes_ += size;
+    return KESTO_OK;
 }
 
 void Courier::rememberWhetherStarted(const CallHead& head)
@@ -152,12 +181,12 @@ void Courier::rememberWhetherStarted(const CallHead& head)
     }
 }
 
-void Courier::loseMailbox(kesto_status status) noexcept
+void Courier::loseWaitingCalls(kesto_status status) noexcept
 {
-    while (const auto record = mailbox_.front()) {
+    while (const auto record = nextRecord()) {
         const CallHead head = readHead(*record);
         const std::unique_ptr<std::string> entries(head.entries);
-        mailbox_.popFront();
+        popRecord();
         if (head.operation == KESTO_OPERATION_SEND)
             ++counters_.lost;
         answerWithError(++lastCall_, head.operation, head.reporter, Callback(head.callback), status);
@@ -174,7 +203,7 @@ Courier::Milliseconds Courier::longestWait() noexcept
 {
     if (!canTakeCalls())
         return forever; // the service has to do something first, and the socket tells when it has
-    if (mailbox_.front())
+    if (nextRecord())
         return Milliseconds(0);
     if (looksByItself())
         return pause_;
@@ -210,7 +239,9 @@ void Courier::changeState(kesto_state state, ConnectionFailure failure)
         const auto until = std::chrono::ceil<Milliseconds>(*retryAt_ - Clock::now());
         retryAfter = static_cast<std::uint32_t>(std::max<std::int64_t>(0, until.count()));
     }
+    isTellingState_.store(true, std::memory_order_relaxed);
     settings_.stateChanged({state, failure.reason, failure.systemError, retryAfter, connection_.path().c_str()});
+    isTellingState_.store(false, std::memory_order_relaxed);
 }
 
 } // namespace libkesto

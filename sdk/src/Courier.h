@@ -15,8 +15,11 @@
 #include <atomic>
 #include <chrono>
 #include <cstdint>
+#include <deque>
 #include <optional>
 #include <set>
+#include <string>
+#include <string_view>
 
 namespace libkesto {
 
@@ -41,6 +44,14 @@ public:
     void stop() noexcept;
     [[nodiscard]] kesto_state state() const noexcept { return state_.load(); }
 
+    // Whether the caller is being told of a change of state. What it gives then, on the client's thread, goes ahead of
+    // what waits in the mailbox: a message that was sent while the connection was made finds the sessions that are made
+    // with it.
+    [[nodiscard]] bool isTellingState() const noexcept { return isTellingState_.load(std::memory_order_relaxed); }
+    // Takes over the callback and the configuration's entries when it answers KESTO_OK. The client's thread.
+    [[nodiscard]] kesto_status putFirst(const CallHead& head, std::string_view reporters,
+                                        std::string_view entries) noexcept;
+
 private:
     void step();
     void connect();
@@ -51,8 +62,10 @@ private:
 
     [[nodiscard]] bool canTakeCalls() const noexcept;
     void takeCalls();
+    [[nodiscard]] std::optional<std::string_view> nextRecord() noexcept;
+    void popRecord() noexcept;
     void rememberWhetherStarted(const CallHead& head);
-    void loseMailbox(kesto_status status) noexcept;
+    void loseWaitingCalls(kesto_status status) noexcept;
 
     [[nodiscard]] bool wait();
     [[nodiscard]] Milliseconds longestWait() noexcept;
@@ -65,9 +78,12 @@ private:
     Counters& counters_;
     std::atomic<kesto_state> state_ = KESTO_STATE_CONNECTING;
     std::atomic<bool> isStopping_ = false;
+    std::atomic<bool> isTellingState_ = false;
 
     // The client's thread's.
     ServiceConnection connection_;
+    std::deque<std::string> firstCalls_; // records that go ahead of the mailbox's
+    std::size_t firstCallsBytes_ = 0;
     CallTable calls_;
     foundation::CborDecoder decoder_;
     Call call_; // the one being taken; kept for its memory

@@ -338,8 +338,8 @@ KESTO_API kesto_state kesto_client_state(const kesto_client* client);
 //
 // When a connection ends, everything that was taken and not answered is lost and answered with KESTO_CONNECTION_LOST,
 // and the service has stopped and forgotten the client's sessions: nothing is sent again. A client that reconnects
-// creates its sessions when its state callback says KESTO_STATE_CONNECTED; what it gives there comes before what
-// other threads give later.
+// creates its sessions when its state callback says KESTO_STATE_CONNECTED: what is given during that callback goes
+// ahead of everything that waits, so that a message sent while the connection was being made finds its session.
 
 // Makes a session. Answered with success.
 KESTO_API kesto_status kesto_client_create_session(kesto_client* client, kesto_reporter reporter,

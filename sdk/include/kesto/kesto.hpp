@@ -286,6 +286,9 @@ private:
 // A list of reporters that stands somewhere else: for arguments and answers, not for keeping.
 class Reporters {
 public:
+    using value_type = ReporterID;
+    using const_iterator = const ReporterID*;
+
     Reporters() noexcept : Reporters(nullptr, 0) { } // an empty list: nobody
     Reporters(const ReporterID& one) noexcept : reporters_(&one), count_(1) { }
     Reporters(std::initializer_list<ReporterID> reporters) noexcept : Reporters(reporters.begin(), reporters.size()) { }

@@ -1,0 +1,181 @@
+// libkesto as its users get it: installed somewhere, found with pkg-config or with CMake, linked by programs that know
+// nothing of its sources. The examples must compile without a warning, and report what they say they do.
+#include "kesto/kesto.h"
+#include "sdk/FakeService.h"
+#include "sdk/Process.h"
+#include "sdk/TemporaryDirectory.h"
+
+#include <filesystem>
+#include <fstream>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sstream>
+
+namespace {
+
+using foundation::Array;
+using foundation::Dictionary;
+using sdk_test::FakeService;
+using sdk_test::Finished;
+using sdk_test::Process;
+using sdk_test::run;
+using testing::HasSubstr;
+using testing::StartsWith;
+
+const std::string buildDirectory = KESTO_BUILD_DIRECTORY;
+const std::string examples = KESTO_EXAMPLES_DIRECTORY;
+const std::string sanitizers = KESTO_SANITIZERS; // what the library needs from a program that links it
+
+std::vector<std::string> words(const std::string& text)
+{
+    std::istringstream stream(text);
+    return {std::istream_iterator<std::string>(stream), {}};
+}
+
+class ExamplesTest : public testing::Test {
+protected:
+    // Installs the library once for all of these tests, and moves what was installed: it has to be found where it is.
+    static void SetUpTestSuite()
+    {
+        directory_ = std::make_unique<sdk_test::TemporaryDirectory>();
+        const std::string first = *directory_ / "first";
+        const Finished installed = run({KESTO_CMAKE, "--install", buildDirectory + "/sdk", "--prefix", first});
+        ASSERT_EQ(installed.status, 0) << installed.output << installed.errors;
+        std::filesystem::rename(first, prefix());
+    }
+    static void TearDownTestSuite() { directory_.reset(); }
+
+    static std::string prefix() { return *directory_ / "moved"; }
+    static std::string library() { return prefix() + "/" + KESTO_LIBRARY_DIRECTORY; }
+
+    static std::vector<std::string> pkgConfig(const std::vector<std::string>& options)
+    {
+        Process::Arguments arguments{"pkg-config"};
+        arguments.insert(arguments.end(), options.begin(), options.end());
+        arguments.emplace_back("kesto");
+        const Finished found = run(arguments, {}, {"PKG_CONFIG_PATH=" + library() + "/pkgconfig"});
+        EXPECT_EQ(found.status, 0) << found.errors;
+        return words(found.output);
+    }
+
+    // Compiles and links with what pkg-config says.
+    static void compile(Process::Arguments command, const std::vector<std::string>& pkgConfigOptions)
+    {
+        for (const auto& extra : {words(sanitizers), pkgConfig(pkgConfigOptions)})
+            command.insert(command.end(), extra.begin(), extra.end());
+        const Finished compiled = run(command);
+        ASSERT_EQ(compiled.status, 0) << compiled.errors;
+        EXPECT_EQ(compiled.errors, "");
+    }
+
+    // Runs a player against a service, which must be told the whole story.
+    static void expectReports(const std::string& program)
+    {
+        const sdk_test::TemporaryDirectory runtime;
+        FakeService service(runtime / "service");
+        const Finished played =
+            run({program}, {}, {"KESTO_SOCKET=" + (runtime / "service"), "LD_LIBRARY_PATH=" + library()});
+        EXPECT_EQ(played.status, 0) << played.errors;
+        EXPECT_EQ(played.errors, "");
+        EXPECT_EQ(played.output, "the session's run has ended\n2 messages answered, 0 lost\n");
+        const std::vector<Array> calls = service.waitForCalls(8);
+        ASSERT_EQ(calls.size(), 8U);
+        constexpr std::array<std::int64_t, 8> methods{1, 2, 4, 5, 6, 6, 7, 8};
+        for (std::size_t index = 0; index < methods.size(); ++index)
+            EXPECT_EQ(sdk_test::method(calls[index]), methods[index]);
+        EXPECT_EQ(*calls[2][2].dictionary(), (Dictionary{{"HostApplicationDisplayID", "org.example.player"}}));
+        EXPECT_EQ(*calls[4][2].dictionary()->find("session_output_running"), foundation::Value(true));
+        EXPECT_EQ(*calls[5][2].dictionary()->find("session_output_running"), foundation::Value(false));
+    }
+
+    static inline std::unique_ptr<sdk_test::TemporaryDirectory> directory_;
+};
+
+TEST_F(ExamplesTest, PkgConfigFindsTheLibraryWhereItWasMovedTo)
+{
+    const auto flags = pkgConfig({"--cflags", "--libs"});
+    EXPECT_THAT(flags, testing::Contains("-lkesto"));
+    EXPECT_EQ(pkgConfig({"--modversion"}).front(), kesto_version());
+    const std::string moved = std::filesystem::canonical(prefix()).string();
+    for (const std::string& flag : flags) {
+        if (flag.starts_with("-I") || flag.starts_with("-L")) {
+            EXPECT_THAT(std::filesystem::weakly_canonical(flag.substr(2)).string(), StartsWith(moved));
+        }
+    }
+}
+
+TEST_F(ExamplesTest, ThePlayerInCReports)
+{
+    const std::string program = *directory_ / "player_c";
+    compile({KESTO_C_COMPILER, "-std=c11", "-Wall", "-Wextra", "-Wpedantic", "-Werror", examples + "/player.c", "-o",
+             program},
+            {"--cflags", "--libs"});
+    expectReports(program);
+}
+
+TEST_F(ExamplesTest, ThePlayerInOlderCPlusPlusReports)
+{
+    const std::string program = *directory_ / "player_cpp";
+    compile({KESTO_CXX_COMPILER, "-std=c++17", "-fno-rtti", "-Wall", "-Wextra", "-Wpedantic", "-Wshadow",
+             "-Wold-style-cast", "-Wconversion", "-Werror", examples + "/player.cpp", "-o", program},
+            {"--cflags", "--libs"});
+    expectReports(program);
+}
+
+TEST_F(ExamplesTest, AProjectFindsTheLibraryWithCMake)
+{
+    const std::string project = *directory_ / "project";
+    std::filesystem::create_directory(project);
+    std::ofstream(project + "/CMakeLists.txt") << "cmake_minimum_required(VERSION 3.20)\n"
+                                                  "project(player LANGUAGES C CXX)\n"
+                                                  "find_package(kesto 0.1 REQUIRED)\n"
+                                                  "add_executable(player "
+                                               << examples
+                                               << "/player.cpp)\n"
+                                                  "target_compile_features(player PRIVATE cxx_std_20)\n"
+                                                  "target_link_libraries(player PRIVATE kesto::kesto)\n"
+                                                  "add_executable(static-player "
+                                               << examples
+                                               << "/player.c)\n"
+                                                  "target_link_libraries(static-player PRIVATE kesto::kesto-static)\n";
+    const Finished configured =
+        run({KESTO_CMAKE, "-S", project, "-B", project + "/build", "-G", "Ninja", "-DCMAKE_PREFIX_PATH=" + prefix(),
+             "-DCMAKE_C_COMPILER=" KESTO_C_COMPILER, "-DCMAKE_CXX_COMPILER=" KESTO_CXX_COMPILER,
+             "-DCMAKE_C_FLAGS=" + sanitizers, "-DCMAKE_CXX_FLAGS=" + sanitizers});
+    ASSERT_EQ(configured.status, 0) << configured.output << configured.errors;
+    const Finished built = run({KESTO_CMAKE, "--build", project + "/build"});
+    ASSERT_EQ(built.status, 0) << built.output << built.errors;
+    expectReports(project + "/build/player");
+    expectReports(project + "/build/static-player");
+}
+
+TEST_F(ExamplesTest, OnlyTheInterfaceIsVisibleFromOutside)
+{
+    const auto expectOnlyOurNames = [](const Finished& listed) {
+        ASSERT_EQ(listed.status, 0) << listed.errors;
+        std::istringstream lines(listed.output);
+        std::size_t functions = 0;
+        for (std::string address, type, name; lines >> address >> type >> name;) {
+            if (type == "A") // the version's own name
+                continue;
+            EXPECT_THAT(name, StartsWith("kesto_"));
+            ++functions;
+        }
+        EXPECT_GT(functions, 30U);
+    };
+    expectOnlyOurNames(run({"nm", "--defined-only", "-D", library() + "/libkesto.so"}));
+    const Finished inArchive = run({"nm", "--defined-only", "-g", library() + "/libkesto.a"});
+    const std::size_t firstLine = inArchive.output.find("libkesto.o:\n");
+    ASSERT_NE(firstLine, std::string::npos);
+    if (sanitizers.empty()) // which bring names of their own
+        expectOnlyOurNames({inArchive.status, inArchive.output.substr(firstLine + 12), inArchive.errors});
+}
+
+TEST_F(ExamplesTest, NeedsNoLibraryButTheLanguages)
+{
+    const Finished needed = run({"readelf", "-d", library() + "/libkesto.so"});
+    EXPECT_THAT(needed.output, HasSubstr("soname: [libkesto.so.0]"));
+    EXPECT_THAT(needed.output, testing::Not(HasSubstr("libfmt")));
+}
+
+} // namespace

@@ -1,0 +1,317 @@
+// What `send` promises: counts, bounds, many threads, no allocation, no system call.
+#include "kesto/kesto.hpp"
+#include "sdk/Allocations.h"
+#include "sdk/FakeService.h"
+#include "sdk/Recorder.h"
+#include "sdk/TemporaryDirectory.h"
+
+#include <atomic>
+#include <csignal>
+#include <cstddef>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <linux/audit.h>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <map>
+#include <optional>
+#include <sys/prctl.h>
+#include <sys/syscall.h>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
+
+namespace {
+
+using foundation::Array;
+using foundation::Dictionary;
+using foundation::Value;
+using kesto::Category;
+using kesto::EventType;
+using kesto::Status;
+using sdk_test::Answers;
+using sdk_test::FakeService;
+using sdk_test::States;
+using testing::ElementsAre;
+
+constexpr std::chrono::milliseconds longEnough = sdk_test::patience;
+
+class SendTest : public testing::Test {
+protected:
+    void connect(FakeService::Handler handler = sdk_test::answerObediently, kesto::Options options = {})
+    {
+        service_.emplace(path_, std::move(handler));
+        options.socketPath = path_;
+        options.stateChanged = states_.callback();
+        ASSERT_EQ(client_.open(options), Status::Ok);
+        ASSERT_EQ(states_.waitFor(1).size(), 1U);
+    }
+
+    Status send(const kesto::Message& message) { return client_.send(message, Category::IO, EventType::Error, 42); }
+
+    // Sends until the queue refuses: how many it took.
+    std::uint64_t fill(const kesto::Message& message)
+    {
+        std::uint64_t taken = 0;
+        for (;;) {
+            const Status status = send(message);
+            if (status != Status::Ok) {
+                EXPECT_EQ(status, Status::QueueFull);
+                return taken;
+            }
+            ++taken;
+        }
+    }
+
+    sdk_test::TemporaryDirectory directory_;
+    const std::string path_ = directory_ / "service";
+    std::optional<FakeService> service_;
+    Answers answers_;
+    States states_;
+    kesto::Client client_;
+};
+
+TEST_F(SendTest, CountsWhatBecameOfEveryMessage)
+{
+    connect();
+    kesto::Message message;
+    kesto::Message unfinished;
+    unfinished.beginArray("list");
+    for (int count = 0; count < 10; ++count)
+        EXPECT_EQ(send(message), Status::Ok);
+    EXPECT_EQ(send(unfinished), Status::Misnested);
+    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    const kesto::Statistics statistics = client_.statistics();
+    EXPECT_EQ(statistics.queued, 10U);
+    EXPECT_EQ(statistics.sent, 10U);
+    EXPECT_EQ(statistics.answered, 10U);
+    EXPECT_EQ(statistics.lost, 0U);
+    EXPECT_EQ(statistics.dropped_unusable, 1U);
+    EXPECT_EQ(statistics.connections, 1U);
+}
+
+TEST_F(SendTest, RefusesAMessageOfMoreThanAQuarterOfTheQueue)
+{
+    kesto::Options options;
+    options.queueBytes = 4096;
+    connect(sdk_test::answerObediently, options);
+    kesto::Message large;
+    EXPECT_EQ(send(large.add("text", std::string(1100, 'x'))), Status::TooLarge);
+    EXPECT_EQ(client_.statistics().dropped_unusable, 1U);
+    EXPECT_EQ(client_.setConfiguration(large, 42), Status::Ok) << "a configuration may be as large as it likes";
+    kesto::Message small;
+    EXPECT_EQ(send(small.add("text", std::string(500, 'x'))), Status::Ok);
+    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.send(small, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(200, 1)),
+              Status::TooLarge);
+}
+
+// A service that does not answer fills the queue, and then messages are refused: memory stays as it is.
+TEST_F(SendTest, RefusesAndCountsWhatDoesNotFitBehindAServiceThatDoesNotAnswer)
+{
+    kesto::Options options;
+    options.queueBytes = 8192;
+    options.unansweredLimit = 16;
+    connect(sdk_test::answerNothing, options);
+    kesto::Message message;
+    message.add("text", "something to say");
+    for (int count = 0; count < 16; ++count)
+        EXPECT_EQ(send(message), Status::Ok);
+    ASSERT_EQ(service_->waitForCalls(16).size(), 16U);
+    const std::uint64_t taken = fill(message);
+    EXPECT_GT(taken, 30U);
+    EXPECT_LT(taken, 8192U / 64);
+    EXPECT_EQ(client_.stopSession(42), Status::Ok) << "room is kept for other calls";
+    kesto::Statistics statistics = client_.statistics();
+    EXPECT_EQ(statistics.queued, 16 + taken);
+    EXPECT_EQ(statistics.sent, 16U);
+    EXPECT_EQ(statistics.dropped_queue_full, 1U);
+
+    service_->forEachPeer([](sdk_test::Peer& peer) {
+        for (std::uint64_t call = 1; call <= 16; ++call)
+            peer.answer(call, {});
+    });
+    EXPECT_EQ(service_->waitForCalls(32).size(), 32U) << "answers make room";
+    client_.close(std::chrono::milliseconds(0));
+    statistics = client_.statistics();
+    EXPECT_EQ(statistics.queued, statistics.answered + statistics.lost);
+    EXPECT_EQ(statistics.answered, 16U);
+}
+
+TEST_F(SendTest, DoesNotPileUpBytesForAServiceThatDoesNotRead)
+{
+    kesto::Options options;
+    options.queueBytes = 64 * 1024;
+    connect(sdk_test::answerObediently, options);
+    service_->setReading(false);
+    kesto::Message message;
+    message.add("text", std::string(8000, 'x'));
+    std::uint64_t taken = 0;
+    while (client_.statistics().dropped_queue_full == 0)
+        taken += send(message) == Status::Ok ? 1 : 0;
+    EXPECT_LT(taken * 8000, 2U * 1024 * 1024) << "the queue, the outbox and the socket's buffer, and no more";
+    service_->setReading(true);
+    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.statistics().answered, taken);
+}
+
+TEST_F(SendTest, TakesMessagesOfManyThreadsAndKeepsTheOrderOfEach)
+{
+    connect();
+    constexpr std::int64_t threads = 4;
+    constexpr std::int64_t messagesEach = 2000;
+    client_.createSession(42);
+    client_.startSession(42);
+    std::vector<std::thread> senders;
+    for (std::int64_t thread = 0; thread < threads; ++thread)
+        senders.emplace_back([this, thread] {
+            kesto::Message message;
+            for (std::int64_t number = 0; number < messagesEach; ++number) {
+                message.clear().add("thread", thread).add("number", number);
+                while (send(message) == Status::QueueFull)
+                    std::this_thread::yield();
+            }
+        });
+    for (std::thread& sender : senders)
+        sender.join();
+    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.statistics().answered, std::uint64_t{threads * messagesEach});
+    std::map<std::int64_t, std::int64_t> next;
+    for (const Array& call : service_->waitForCalls(threads * messagesEach + 2)) {
+        if (sdk_test::method(call) != 6)
+            continue;
+        const Dictionary message = *call[2].dictionary();
+        const std::int64_t thread = message.find("thread")->number()->int64Value();
+        EXPECT_EQ(message.find("number")->number()->int64Value(), next[thread]++);
+    }
+    EXPECT_EQ(next,
+              (std::map<std::int64_t, std::int64_t>{
+                  {0, messagesEach}, {1, messagesEach}, {2, messagesEach}, {3, messagesEach}}));
+}
+
+// Nothing but the message itself can bring the thread to send it.
+TEST_F(SendTest, WakesAThreadThatSleeps)
+{
+    for (const bool wakeOnSend : {false, true}) {
+        kesto::Options options;
+        options.socketPath = path_;
+        options.wakeOnSend = wakeOnSend;
+        const FakeService service(path_);
+        Answers answers;
+        kesto::Client client;
+        ASSERT_EQ(client.open(options), Status::Ok);
+        const kesto::Message message;
+        for (std::size_t count = 1; count <= 50; ++count) {
+            ASSERT_EQ(client.send(message, Category::IO, EventType::Error, 42, answers.named("send")), Status::Ok);
+            ASSERT_EQ(answers.waitFor(count).size(), count);
+        }
+    }
+}
+
+// While a session is started the thread looks by itself, so that its messages arrive without anybody ringing.
+TEST_F(SendTest, ReachesTheServiceWithoutRingingWhileASessionIsStarted)
+{
+    connect();
+    client_.createSession(42);
+    client_.startSession(42);
+    ASSERT_EQ(client_.flush(longEnough), Status::Ok);
+    const kesto::Message message;
+    for (std::size_t count = 1; count <= 10; ++count) {
+        ASSERT_EQ(client_.send(message, Category::IO, EventType::Error, 42, answers_.named("send")), Status::Ok);
+        ASSERT_EQ(answers_.waitFor(count).size(), count);
+    }
+}
+
+TEST_F(SendTest, AllocatesNothing)
+{
+    connect();
+    client_.createSession(42);
+    client_.startSession(42);
+    kesto::Message message;
+    message.reserve(256);
+    const std::vector<kesto::ReporterID> reporters{42, 43};
+    const std::size_t before = sdk_test::allocations();
+    for (int count = 0; count < 1000; ++count) {
+        message.clear().add("volume", 0.5).add("running", true);
+        client_.send(message, Category::Playback, EventType::Start, reporters);
+    }
+    EXPECT_EQ(sdk_test::allocations(), before);
+}
+
+// ---- No system call ----
+
+// From here on every system call of this thread but the end of the process kills it.
+void forbidSystemCalls()
+{
+    sock_filter program[] = {
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_exit_group, 0, 1),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_KILL_PROCESS),
+    };
+    const sock_fprog filter{static_cast<unsigned short>(std::size(program)), program};
+    if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0 || ::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &filter) != 0)
+        ::_exit(99);
+}
+
+constexpr std::uint64_t messagesWithoutSystemCalls = 20'000;
+
+// In a process of its own: makes a client and then, while system calls are forbidden, sends until so many messages are
+// answered. With a started session as fast as the queue takes them; without one each when the one before has been
+// answered, so that the client's thread goes to sleep in between.
+[[noreturn]] void sendWithoutSystemCalls(const std::string& path, bool isStarted)
+{
+    ::alarm(static_cast<unsigned>(sdk_test::patience.count()));
+    kesto::Client client;
+    kesto::Options options;
+    options.socketPath = path;
+    if (client.open(options) != Status::Ok)
+        ::_exit(1);
+    client.createSession(42);
+    if (isStarted)
+        client.startSession(42);
+    else if (client.flush(longEnough) != Status::Ok)
+        ::_exit(2);
+    kesto::Message message;
+    message.reserve(1024);
+    forbidSystemCalls();
+    std::uint64_t queued = 0;
+    std::uint64_t answered = 0;
+    while (answered < messagesWithoutSystemCalls) {
+        answered = client.statistics().answered;
+        if (queued == messagesWithoutSystemCalls || (!isStarted && answered < queued))
+            continue;
+        message.clear().add("number", queued).add("volume", 0.5).add("device", "Speaker");
+        queued += client.send(message, Category::Playback, EventType::Start, 42) == Status::Ok ? 1 : 0;
+    }
+    ::_exit(0);
+}
+
+int statusOfSendingWithoutSystemCalls(const std::string& path, bool isStarted)
+{
+    const pid_t child = ::fork();
+    if (child == 0)
+        sendWithoutSystemCalls(path, isStarted);
+    int status = 0;
+    EXPECT_EQ(::waitpid(child, &status, 0), child);
+    return status;
+}
+
+TEST(SendWithoutSystemCalls, IsWhatItDoesWhileASessionIsStarted)
+{
+    const sdk_test::TemporaryDirectory directory;
+    FakeService service(directory / "service");
+    const int status = statusOfSendingWithoutSystemCalls(directory / "service", true);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "status " << status;
+    EXPECT_GE(service.waitForCalls(messagesWithoutSystemCalls).size(), messagesWithoutSystemCalls);
+}
+
+TEST(SendWithoutSystemCalls, IsNotWhatItDoesWhenTheThreadHasToBeWoken)
+{
+    const sdk_test::TemporaryDirectory directory;
+    FakeService service(directory / "service");
+    const int status = statusOfSendingWithoutSystemCalls(directory / "service", false);
+    EXPECT_TRUE(WIFSIGNALED(status) && WTERMSIG(status) == SIGSYS) << "status " << status;
+}
+
+} // namespace
