@@ -1,0 +1,134 @@
+#include "end_to_end/Kestod.h"
+
+#include <csignal>
+#include <fcntl.h>
+#include <gtest/gtest.h>
+#include <sqlite3.h>
+#include <stdexcept>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
+
+namespace end_to_end {
+namespace {
+
+namespace fs = std::filesystem;
+
+} // namespace
+
+Kestod::Kestod(const Files& configuration, Environment further)
+{
+    for (const char* name : {"run", "state", "logs", "configuration"})
+        fs::create_directory(directory() / name);
+    for (const auto& [name, text] : configuration) {
+        const fs::path path = directory() / "configuration" / name;
+        fs::create_directories(path.parent_path());
+        support::writeFile(path, text);
+    }
+    environment_ = {
+        {"RUNTIME_DIRECTORY", directory() / "run"}, {"STATE_DIRECTORY", directory() / "state"},
+        {"LOGS_DIRECTORY", directory() / "logs"},   {"CONFIGURATION_DIRECTORY", directory() / "configuration"},
+        {"KESTO_SERVICE_NAME", "kesto.socket"},     {"KESTO_LOG", "debug"}};
+    for (auto& [name, value] : further)
+        environment_[name] = std::move(value);
+}
+
+Kestod::~Kestod()
+{
+    kill();
+    if (testing::Test::HasFailure())
+        std::fprintf(stderr, "--- log of the service:\n%s", log().c_str());
+}
+
+void Kestod::start()
+{
+    std::vector<std::string> variables;
+    for (const auto& [name, value] : environment_)
+        if (!value.empty())
+            variables.push_back(name + "=" + value);
+    for (const char* name : {"ASAN_OPTIONS", "TSAN_OPTIONS", "UBSAN_OPTIONS", "LSAN_OPTIONS", "LD_LIBRARY_PATH"})
+        if (const char* value = std::getenv(name))
+            variables.push_back(std::string(name) + "=" + value);
+    std::vector<char*> pointers;
+    for (std::string& variable : variables)
+        pointers.push_back(variable.data());
+    pointers.push_back(nullptr);
+
+    const fs::path logPath = directory() / "log";
+    process_ = ::fork();
+    if (process_ == 0) {
+        const int log = ::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+        ::dup2(log, STDERR_FILENO);
+        char name[] = "kestod";
+        char* arguments[] = {name, nullptr};
+        ::execve(KESTOD_PATH, arguments, pointers.data());
+        ::_exit(127);
+    }
+}
+
+void Kestod::kill()
+{
+    if (process_ == 0)
+        return;
+    ::kill(process_, SIGKILL);
+    ::waitpid(process_, nullptr, 0);
+    process_ = 0;
+}
+
+int Kestod::exitStatus()
+{
+    int status = 0;
+    if (!waitUntil([&] { return ::waitpid(process_, &status, WNOHANG) == process_; }))
+        throw std::runtime_error("the service does not end");
+    process_ = 0;
+    return WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status);
+}
+
+std::string Kestod::log() const
+{
+    return support::readFile(directory() / "log");
+}
+
+bool Kestod::waitForLog(std::string_view text) const
+{
+    return waitUntil([&] { return log().contains(text); });
+}
+
+std::size_t Kestod::countInLog(std::string_view text) const
+{
+    const std::string all = log();
+    std::size_t count = 0;
+    for (std::size_t at = all.find(text); at != std::string::npos; at = all.find(text, at + 1))
+        ++count;
+    return count;
+}
+
+std::vector<StoredEvent> Kestod::events(std::string_view pattern) const
+{
+    const fs::path path = directory() / "state" / "analytics.sqlite3";
+    std::vector<StoredEvent> events;
+    sqlite3* database = nullptr;
+    sqlite3_stmt* query = nullptr;
+    if (sqlite3_open_v2(path.c_str(), &database, SQLITE_OPEN_READONLY, nullptr) == SQLITE_OK
+        && sqlite3_prepare_v2(database, "SELECT name, payload FROM events WHERE name GLOB ?1 ORDER BY id", -1, &query,
+                              nullptr)
+            == SQLITE_OK) {
+        sqlite3_bind_text(query, 1, pattern.data(), static_cast<int>(pattern.size()), SQLITE_TRANSIENT);
+        const auto text = [&](int column) {
+            return std::string(reinterpret_cast<const char*>(sqlite3_column_text(query, column)));
+        };
+        while (sqlite3_step(query) == SQLITE_ROW)
+            events.push_back({text(0), text(1)});
+    }
+    sqlite3_finalize(query);
+    sqlite3_close(database);
+    return events;
+}
+
+std::vector<StoredEvent> Kestod::waitForEvents(std::string_view pattern) const
+{
+    waitUntil([&] { return !events(pattern).empty(); });
+    return events(pattern);
+}
+
+} // namespace end_to_end

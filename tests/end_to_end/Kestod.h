@@ -1,0 +1,79 @@
+// A real service process on a private socket, in directories of its own.
+#pragma once
+
+#include "foundation/Value.h"
+#include "platform/linux/TemporaryDirectory.h"
+
+#include <chrono>
+#include <filesystem>
+#include <map>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <sys/types.h>
+#include <thread>
+#include <vector>
+
+namespace end_to_end {
+
+// How long a test waits for something that must happen.
+constexpr std::chrono::seconds patience(30);
+
+// Waits until the condition holds; false when it does not come to.
+template <typename Condition> bool waitUntil(Condition condition)
+{
+    const auto end = std::chrono::steady_clock::now() + patience;
+    while (!condition()) {
+        if (std::chrono::steady_clock::now() > end)
+            return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(2));
+    }
+    return true;
+}
+
+// One row of the store.
+struct StoredEvent {
+    std::string name;
+    std::string payload; // JSON
+};
+
+// One thread. The process ends with this object, if it has not ended before.
+class Kestod {
+public:
+    using Environment = std::map<std::string, std::string>;
+    // Files of the configuration directory by name, such as "device.toml".
+    using Files = std::map<std::string, std::string>;
+
+    // Makes the directories and the files; starts nothing. Further variables come on top of the usual ones; one that
+    // is empty is not set at all.
+    explicit Kestod(const Files& configuration = {}, Environment further = {});
+    ~Kestod();
+    Kestod(const Kestod&) = delete;
+    Kestod& operator=(const Kestod&) = delete;
+
+    // Starts the process; clients that connect at once wait for it.
+    void start();
+    void kill();
+    // Waits for the process to end by itself.
+    [[nodiscard]] int exitStatus();
+
+    [[nodiscard]] const std::filesystem::path& directory() const { return directory_.path(); }
+    [[nodiscard]] std::filesystem::path socketPath() const { return directory() / "run" / "kesto.socket"; }
+    // What the process wrote on standard error so far.
+    [[nodiscard]] std::string log() const;
+    // Waits until the log holds the text; false when it does not come.
+    [[nodiscard]] bool waitForLog(std::string_view text) const;
+    [[nodiscard]] std::size_t countInLog(std::string_view text) const;
+
+    // The stored events of names that match the pattern (GLOB), in order.
+    [[nodiscard]] std::vector<StoredEvent> events(std::string_view pattern = "*") const;
+    // Waits until there is such an event.
+    [[nodiscard]] std::vector<StoredEvent> waitForEvents(std::string_view pattern) const;
+
+private:
+    const support::TemporaryDirectory directory_;
+    Environment environment_;
+    pid_t process_ = 0;
+};
+
+} // namespace end_to_end

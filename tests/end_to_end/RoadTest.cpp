@@ -1,0 +1,275 @@
+// The whole road, from a client's call to a stored event, through a real service.
+#include "end_to_end/Kestod.h"
+#include "end_to_end/WireClient.h"
+
+#include <csignal>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+namespace end_to_end {
+namespace {
+
+using foundation::Array;
+using foundation::Dictionary;
+using foundation::Value;
+using testing::ElementsAre;
+using testing::Field;
+using testing::HasSubstr;
+using testing::MatchesRegex;
+using testing::SizeIs;
+
+const Value null;
+constexpr int playback = 4;
+constexpr int typeStart = 1;
+constexpr int typeStop = 2;
+
+Array success(std::uint64_t call)
+{
+    return {call, null, true};
+}
+
+class RoadTest : public testing::Test {
+protected:
+    void SetUp() override { kestod.start(); }
+    Kestod kestod;
+};
+
+auto named(std::string_view name)
+{
+    return Field(&StoredEvent::name, name);
+}
+
+TEST_F(RoadTest, AMessageBecomesTwoStoredEventsWithTheApplicationAdded)
+{
+    WireClient client(kestod.socketPath());
+    EXPECT_EQ(client.ask(Create, 42), success(1));
+    EXPECT_EQ(client.ask(SetServiceType, 7, 42), success(2));
+    EXPECT_EQ(client.ask(SetConfiguration, Dictionary{{"HostApplicationDisplayID", "org.example.player"}}, 42),
+              success(3));
+    const auto start = client.call(Start, 42);
+    EXPECT_EQ(client.ask(SendMessage, Dictionary{{"volume", 0.5}}, playback, typeStart, Array{42}), (Array{5, null}));
+    const auto stop = client.call(Stop, 42);
+    EXPECT_EQ(client.nextReply(), success(start));
+    EXPECT_EQ(client.nextReply(), success(stop));
+
+    const auto events = kestod.events();
+    ASSERT_THAT(events,
+                ElementsAre(named("com.quarn.kesto.Playback.Start"), named("com.quarn.longformaudio.Playback.Start")));
+    EXPECT_EQ(events[0].payload, R"({"volume":0.5,"HostApplicationDisplayID":"org.example.player"})");
+    EXPECT_EQ(events[1].payload, events[0].payload);
+}
+
+TEST_F(RoadTest, WhatIsAcknowledgedIsKeptWhenTheServiceIsKilled)
+{
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    client.call(Start, 1);
+    constexpr int count = 500;
+    for (int number = 0; number < count; ++number)
+        client.call(SendMessage, Dictionary{{"number", number}}, playback, typeStart, Array{1});
+    int acknowledged = 0;
+    while (acknowledged < count / 2) {
+        ASSERT_TRUE(client.nextReply());
+        ++acknowledged;
+    }
+    kestod.kill();
+    while (client.nextReply()) // those that had left already
+        ++acknowledged;
+    EXPECT_GE(kestod.events("com.quarn.kesto.*").size(), static_cast<std::size_t>(acknowledged));
+}
+
+TEST_F(RoadTest, TwoClientsAtOnceDoNotMix)
+{
+    WireClient first(kestod.socketPath());
+    WireClient second(kestod.socketPath());
+    for (WireClient* client : {&first, &second}) {
+        client->ask(Create, 7);
+        client->call(Start, 7);
+    }
+    EXPECT_EQ(second.ask(SetServiceType, 10, 7), success(3));
+    EXPECT_EQ(first.ask(GetServiceName, 7), (Array{3, null, 0}));
+    EXPECT_EQ(second.ask(GetServiceName, 7), (Array{4, null, 10}));
+    first.ask(SendMessage, Dictionary{{"from", "first"}}, playback, typeStart, Array{7});
+    second.ask(SendMessage, Dictionary{{"from", "second"}}, playback, typeStart, Array{7});
+    EXPECT_THAT(kestod.events("com.quarn.generic.*"), ElementsAre(Field(&StoredEvent::payload, HasSubstr("first"))));
+    EXPECT_THAT(kestod.events("com.quarn.alerts.*"), ElementsAre(Field(&StoredEvent::payload, HasSubstr("second"))));
+}
+
+TEST_F(RoadTest, ASessionOfAnotherClientIsReachedBySendingAndValidatingButNotByStarting)
+{
+    WireClient owner(kestod.socketPath());
+    owner.ask(Create, 5);
+    owner.ask(SetServiceType, 3, 5);
+    WireClient other(kestod.socketPath());
+    EXPECT_EQ(other.ask(Validate, 5), (Array{1, null, Dictionary{{"reporterID", 5}, {"serviceType", 3}}}));
+    EXPECT_EQ(other.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, Array{5}), (Array{2, null}));
+    EXPECT_THAT(kestod.events("com.quarn.haptics.*"), SizeIs(1));
+    EXPECT_EQ(other.ask(Start, 5), success(3)); // at once: not its own
+    EXPECT_EQ(other.ask(GetAllReporters), (Array{4, null, Array{5}}));
+}
+
+TEST_F(RoadTest, TheServiceTypeOfNoSessionIsAnsweredTwice)
+{
+    WireClient client(kestod.socketPath());
+    const auto call = client.call(GetServiceName, 0);
+    EXPECT_EQ(client.nextReply(), (Array{call, null, 65535}));
+    EXPECT_EQ(client.nextReply(), (Array{call, null, 65535}));
+    EXPECT_EQ(client.ask(Validate, 99), (Array{2, null, Dictionary{{"reporterID", 0}, {"serviceType", 65535}}}));
+}
+
+TEST_F(RoadTest, TheAnswerToAStartIsHeldUntilTheStopAndOtherCallsOvertakeIt)
+{
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    const auto start = client.call(Start, 1);
+    EXPECT_EQ(client.ask(Start, 1), success(3)); // already started: at once
+    EXPECT_EQ(client.ask(GetAllReporters), (Array{4, null, Array{1}}));
+    const auto stop = client.call(Stop, 1);
+    EXPECT_EQ(client.nextReply(), success(start));
+    EXPECT_EQ(client.nextReply(), success(stop));
+}
+
+TEST_F(RoadTest, WithoutAListAllStartedSessionsGetTheMessage)
+{
+    WireClient first(kestod.socketPath());
+    WireClient second(kestod.socketPath());
+    first.ask(Create, 1);
+    first.ask(SetServiceType, 4, 1);
+    first.call(Start, 1);
+    first.ask(Create, 2);
+    second.ask(Create, 3);
+    second.ask(SetServiceType, 10, 3);
+    second.call(Start, 3);
+    second.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStop, null);
+    EXPECT_THAT(kestod.events("*.Playback.Stop"),
+                ElementsAre(named("com.quarn.kesto.Playback.Stop"), named("com.quarn.alarms.Playback.Stop"),
+                            named("com.quarn.kesto.Playback.Stop"), named("com.quarn.alerts.Playback.Stop")));
+}
+
+TEST_F(RoadTest, WithoutAListAndWithoutSessionsTheMessageStandsAlone)
+{
+    WireClient client(kestod.socketPath());
+    EXPECT_EQ(client.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, null), (Array{1, null}));
+    const auto events = kestod.events();
+    ASSERT_THAT(events,
+                ElementsAre(named("com.quarn.kesto.Playback.Start"), named("com.quarn.standalone.Playback.Start")));
+    EXPECT_EQ(events[0].payload, R"({"a":1,"HostApplicationDisplayID":"Unknown"})");
+}
+
+TEST_F(RoadTest, AnEmptyListGoesNowhere)
+{
+    WireClient client(kestod.socketPath());
+    EXPECT_EQ(client.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, Array{}), (Array{1, null}));
+    EXPECT_THAT(kestod.events(), SizeIs(0));
+}
+
+TEST_F(RoadTest, AClientThatDisconnectsLeavesAnUptimeEvent)
+{
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    client.call(Start, 1);
+    client.ask(GetAllReporters);
+    client.close();
+    const auto events = kestod.waitForEvents("com.quarn.kesto.kestoreportingclientuptime");
+    ASSERT_THAT(events, SizeIs(1));
+    EXPECT_THAT(events[0].payload, MatchesRegex(R"(\{"processName":"end_to_end_test","seconds":[0-9.e-]+\})"));
+    EXPECT_TRUE(kestod.waitForLog("ending session 1"));
+    EXPECT_TRUE(kestod.waitForLog("removing " + std::to_string(::getpid()) + " from the server client list"));
+    EXPECT_FALSE(kestod.log().contains("interruptionHandler"));
+}
+
+TEST_F(RoadTest, AResetIsAnInterruptionAndThenAnInvalidationAndStopsSessionsOnce)
+{
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 77);
+    client.call(Start, 77);
+    client.ask(GetAllReporters);
+    client.reset();
+    ASSERT_TRUE(kestod.waitForLog("deallocing this session 77"));
+    const std::string log = kestod.log();
+    const auto interruption = log.find("interruptionHandler: connection exited");
+    ASSERT_NE(interruption, std::string::npos);
+    EXPECT_NE(log.find("invalidationHandler: connection exited", interruption), std::string::npos);
+    EXPECT_EQ(kestod.countInLog("ending session 77"), 2U); // both lines of one stop
+}
+
+TEST_F(RoadTest, KillServiceEndsTheProcessWithStatus2)
+{
+    WireClient client(kestod.socketPath());
+    client.call(KillService);
+    EXPECT_TRUE(client.isClosed());
+    EXPECT_EQ(kestod.exitStatus(), 2);
+    EXPECT_THAT(kestod.log(), HasSubstr("DESTROYING SERVICE"));
+}
+
+TEST_F(RoadTest, AServiceThatWasKilledStartsAgainAtItsStaleSocket)
+{
+    WireClient(kestod.socketPath()).ask(SendMessage, Dictionary{{"run", 1}}, playback, typeStart, null);
+    kestod.kill();
+    kestod.start();
+    WireClient(kestod.socketPath()).ask(SendMessage, Dictionary{{"run", 2}}, playback, typeStart, null);
+    EXPECT_THAT(kestod.events("com.quarn.kesto.Playback.Start"), SizeIs(2));
+}
+
+TEST(FeatureRoadTest, ARingerSwitchReachesASessionThatIsNotStartedToo)
+{
+    Kestod kestod;
+    kestod.start();
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    support::replaceFile(kestod.directory() / "run/notifications/com.quarn.halden.ringerstate", "1");
+    ASSERT_TRUE(kestod.waitForLog(R"(defaults {"ringerstate":true)"));
+    EXPECT_TRUE(kestod.waitForLog("sending message for session owned by 1"));
+}
+
+TEST(CustomerRoadTest, EventsKeepTheTimeStampThatRecordedMessagesLose)
+{
+    Kestod kestod;
+    kestod.start();
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    client.call(Start, 1);
+    client.ask(
+        SendMessage,
+        Dictionary{{"session_output_running", true}, {"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 10.0}},
+        playback, typeStart, Array{1});
+    client.ask(SendMessage, Dictionary{{"session_output_running", false}, {"kestoreporting_timestamp", 20.0}}, playback,
+               typeStop, Array{1});
+    client.call(Stop, 1);
+    client.nextReply();
+    client.nextReply();
+    EXPECT_THAT(kestod.events("com.quarn.kesto.Playback.Start"),
+                ElementsAre(Field(&StoredEvent::payload, HasSubstr("kestoreporting_timestamp"))));
+    EXPECT_THAT(kestod.events("com.quarn.kesto.Volume.Summary"), SizeIs(0)); // every stretch measures 0
+    EXPECT_FALSE(std::filesystem::exists(kestod.directory() / "logs/Audio"));
+}
+
+TEST(InternalRoadTest, PlayingBecomesAVolumeEventAndASummaryFile)
+{
+    Kestod kestod(Kestod::Files{{"device.toml", "InternalBuild = true\n"}});
+    kestod.start();
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    client.call(Start, 1);
+    client.ask(
+        SendMessage,
+        Dictionary{{"session_output_running", true}, {"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 10.0}},
+        playback, typeStart, Array{1});
+    client.ask(SendMessage, Dictionary{{"session_output_running", false}, {"kestoreporting_timestamp", 20.6}}, playback,
+               typeStop, Array{1});
+    client.call(Stop, 1);
+    client.nextReply();
+    client.nextReply();
+    EXPECT_THAT(kestod.events("com.quarn.kesto.Volume.Summary"),
+                ElementsAre(Field(&StoredEvent::payload, HasSubstr(R"("play_seconds":10.6)"))));
+    std::size_t files = 0;
+    for (const auto& file : std::filesystem::directory_iterator(kestod.directory() / "logs/Audio/Reporting")) {
+        ++files;
+        EXPECT_THAT(support::readFile(file.path()), HasSubstr("Volume_Summary_1"));
+    }
+    EXPECT_EQ(files, 1U);
+}
+
+} // namespace
+} // namespace end_to_end
