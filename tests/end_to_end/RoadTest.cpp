@@ -245,6 +245,20 @@ TEST(CustomerRoadTest, EventsKeepTheTimeStampThatRecordedMessagesLose)
     EXPECT_FALSE(std::filesystem::exists(kestod.directory() / "logs/Audio"));
 }
 
+TEST(UnwantedRoadTest, NothingIsStoredWhoseNameNobodyWants)
+{
+    Kestod kestod(Kestod::Files{{"analytics.toml", "used = [\"com.quarn.alerts.*\"]\n"}});
+    kestod.start();
+    {
+        WireClient client(kestod.socketPath());
+        client.ask(Create, 1);
+        client.ask(SetServiceType, 10, 1);
+        client.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, Array{1});
+    }
+    ASSERT_TRUE(kestod.waitForLog("dealloc"));
+    EXPECT_THAT(kestod.events(), ElementsAre(named("com.quarn.alerts.Playback.Start"))); // no uptime event either
+}
+
 TEST(InternalRoadTest, PlayingBecomesAVolumeEventAndASummaryFile)
 {
     Kestod kestod(Kestod::Files{{"device.toml", "InternalBuild = true\n"}});

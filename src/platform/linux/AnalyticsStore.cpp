@@ -112,6 +112,8 @@ AnalyticsStore::~AnalyticsStore()
 
 void AnalyticsStore::sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder)
 {
+    if (!isAnalyticsEventUsed(eventName)) // of those that ask before, this costs little
+        return;
     AnalyticsEvent event{clock_.secondsSince1970(), std::move(eventName), payloadBuilder()};
     const foundation::Lock lock(lock_);
     if (SerialQueue::isTurnRunning()) {
