@@ -2,21 +2,16 @@
 
 #include "platform/linux/Outbox.h"
 #include "platform/linux/SerialQueue.h"
+#include "platform/linux/SystemErrorText.h"
 
 #include <cerrno>
 #include <fmt/format.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
-#include <system_error>
 #include <utility>
 
 namespace platform {
 namespace {
-
-std::string systemErrorText(int error)
-{
-    return std::generic_category().message(error);
-}
 
 // Both counts in one number, so that exactly one thread sees them fall below the limits.
 constexpr std::uint64_t unansweredCall(std::size_t bytes) noexcept
@@ -69,7 +64,7 @@ void LinuxConnection::resume()
     event.data.ptr = this;
     isResumed_ = ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_ADD, socket_.get(), &event) == 0;
     if (!isResumed_)
-        breakReason_ = systemErrorText(errno);
+        breakReason_.emplace(systemErrorText(errno));
 }
 
 bool LinuxConnection::handle(std::uint32_t events)
@@ -120,7 +115,7 @@ void LinuxConnection::read()
     else if (count == 0)
         endOfStream();
     else if (errno != EAGAIN && errno != EINTR)
-        breakOff(systemErrorText(errno));
+        breakOff(std::string(systemErrorText(errno)));
 }
 
 void LinuxConnection::endOfStream()

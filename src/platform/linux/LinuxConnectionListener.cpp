@@ -1,6 +1,7 @@
 #include "platform/linux/LinuxConnectionListener.h"
 
 #include "platform/linux/SerialQueue.h"
+#include "platform/linux/SystemErrorText.h"
 
 #include <algorithm>
 #include <array>
@@ -168,7 +169,7 @@ void LinuxConnectionListener::pauseAccepting(std::optional<Clock::duration> paus
     ++hub_->counters.acceptingPauses;
     if (!std::exchange(pauseIsLogged_, true))
         KESTO_LOG(hub_->log, Error, "new connections have to wait, with {} open: {}", connections_.size(),
-                  std::generic_category().message(error));
+                  systemErrorText(error));
 }
 
 void LinuxConnectionListener::resumeAccepting()

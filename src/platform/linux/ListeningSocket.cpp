@@ -1,12 +1,13 @@
 #include "platform/linux/ListeningSocket.h"
 
+#include "platform/linux/SystemErrorText.h"
+
 #include <cerrno>
 #include <cstring>
 #include <fcntl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <system_error>
 #include <systemd/sd-daemon.h>
 
 namespace platform {
@@ -60,7 +61,7 @@ std::string description(const ListeningSocketFailure& failure)
     case ListeningSocketError::PathTooLong: return "the path is too long for a socket";
     case ListeningSocketError::NotASocket: return "something that is not a socket is in the way";
     case ListeningSocketError::AlreadyInUse: return "another process listens there";
-    case ListeningSocketError::SystemError: return std::generic_category().message(failure.systemError);
+    case ListeningSocketError::SystemError: return std::string(systemErrorText(failure.systemError));
     }
     return "unknown error";
 }

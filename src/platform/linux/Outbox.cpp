@@ -3,8 +3,8 @@
 #include "platform/linux/FrameReader.h"
 #include "platform/linux/LinuxConnection.h"
 
-#include <algorithm>
 #include <string>
+#include <unordered_map>
 #include <utility>
 #include <vector>
 
@@ -21,18 +21,19 @@ using Letters = std::vector<Letter>;
 
 thread_local Letters gathered; // one answer after the other for the same connection makes one letter already
 
-// Makes one letter of those for the same connection.
-void merge(Letters& letters)
+// One letter of all those for the same connection, in their order.
+Letters merged(Letters letters)
 {
-    std::ranges::stable_sort(letters, {}, [](const Letter& letter) { return letter.connection.get(); });
-    auto last = letters.begin();
-    for (auto letter = last + 1; letter != letters.end(); ++letter) {
-        if (letter->connection == last->connection)
-            last->frames += letter->frames;
+    Letters result;
+    std::unordered_map<const LinuxConnection*, std::size_t> places;
+    for (Letter& letter : letters) {
+        const auto [place, isFirst] = places.try_emplace(letter.connection.get(), result.size());
+        if (isFirst)
+            result.push_back(std::move(letter));
         else
-            *++last = std::move(*letter);
+            result[place->second].frames += letter.frames;
     }
-    letters.erase(last + 1, letters.end());
+    return result;
 }
 
 } // namespace
@@ -48,12 +49,12 @@ WorkItem Outbox::endTurn()
 {
     if (gathered.empty())
         return nullptr;
-    if (gathered.size() > 1)
-        merge(gathered);
-    return [letters = std::exchange(gathered, {})]() mutable {
+    Letters turn = std::exchange(gathered, {});
+    if (turn.size() > 1)
+        turn = merged(std::move(turn));
+    return [letters = std::move(turn)]() mutable {
         for (Letter& letter : letters)
             letter.connection->write(std::move(letter.frames));
-        letters.clear();
     };
 }
 

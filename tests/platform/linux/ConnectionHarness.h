@@ -202,7 +202,7 @@ protected:
     using Handler = std::function<std::expected<void, platform::Connection::Violation>(ConnectionRecord&,
                                                                                        platform::Connection::Call&)>;
 
-    ~ConnectionTest() override { stop(); }
+    void TearDown() override { stop(); } // while all of the test is there still
 
     // Starts the listener and returns when it is listening.
     void listen()

@@ -155,7 +155,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheUnansweredCallsAreTooMany)
 TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
 {
     constexpr int starts = 10'000;
-    constexpr std::uint64_t others = 100'000;
+    constexpr std::uint64_t others = 50'000;
     std::vector<std::shared_ptr<void>> held;
     std::atomic<std::uint64_t> answered = 0;
     handler = [&](ConnectionRecord&, Connection::Call& call) -> std::expected<void, Connection::Violation> {
@@ -186,7 +186,7 @@ TEST_F(ConnectionLimits, AClientThatGoesWhileItIsNotReadFromIsNoticed)
 
 TEST_F(ConnectionLimits, CreditGivenBackFromManyThreadsIsAllThere)
 {
-    constexpr int rounds = 200'000;
+    constexpr int rounds = 50'000;
     std::mutex mutex;
     std::vector<std::shared_ptr<void>> held;
     std::atomic<std::uint64_t> delivered = 0;

@@ -433,7 +433,7 @@ protected:
         });
         queue = queues.makeSerialQueue("server", QualityOfService::UserInteractive);
     }
-    ~Turns() override
+    void TearDown() override
     {
         stop();
         queue.reset();

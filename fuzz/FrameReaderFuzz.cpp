@@ -1,0 +1,83 @@
+// What a client writes to its connection, cut as the socket may cut it. However the stream is cut, the same frames
+// must come of it, up to the same error; no more may be held than came; and decoding what the frames hold must
+// end, with the decoder of one connection remembering from one frame to the next.
+//
+// The first byte of the input chooses the cuts, the rest is the stream.
+#include "foundation/Cbor.h"
+#include "platform/linux/FrameReader.h"
+
+#include <algorithm>
+#include <cstdint>
+#include <cstdlib>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace {
+
+using platform::FrameReader;
+
+void require(bool holds)
+{
+    if (!holds)
+        std::abort();
+}
+
+struct Outcome {
+    std::vector<std::string> frames;
+    bool isBroken = false;
+    bool endsInsideFrame = false;
+    friend bool operator==(const Outcome&, const Outcome&) = default;
+};
+
+// Takes the frames that are whole; false after an error.
+bool takeFrames(FrameReader& reader, std::vector<std::string>& frames)
+{
+    while (true) {
+        const auto frame = reader.next();
+        if (!frame)
+            return false;
+        if (!*frame)
+            return true;
+        require((*frame)->size() <= platform::longestFrame);
+        frames.emplace_back(**frame);
+    }
+}
+
+// Pieces of so many bytes, each a copy of its own, so that reading beyond one is noticed.
+Outcome read(std::string_view stream, std::size_t pieceSize)
+{
+    Outcome outcome;
+    FrameReader reader;
+    for (std::size_t taken = 0; taken < stream.size(); taken += pieceSize) {
+        const std::vector<char> piece(stream.begin() + static_cast<std::ptrdiff_t>(taken),
+                                      stream.begin()
+                                          + static_cast<std::ptrdiff_t>(std::min(taken + pieceSize, stream.size())));
+        reader.feed({piece.data(), piece.size()});
+        if (!takeFrames(reader, outcome.frames)) {
+            outcome.isBroken = true;
+            return outcome;
+        }
+        require(reader.heldBytes() <= 64 + 2 * (taken + piece.size()));
+    }
+    outcome.endsInsideFrame = reader.isInsideFrame();
+    return outcome;
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    if (size == 0)
+        return 0;
+    const std::string_view stream(reinterpret_cast<const char*>(data) + 1, size - 1);
+    const Outcome whole = read(stream, stream.size() + 1);
+    require(read(stream, 1 + data[0] % 64) == whole);
+
+    foundation::CborDecoder decoder;
+    for (const std::string& frame : whole.frames) {
+        if (!decoder.decode(frame))
+            break; // where the connection ends
+    }
+    return 0;
+}
