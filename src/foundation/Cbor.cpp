@@ -2,6 +2,8 @@
 // recurses only into containers, which are counted, and trusts no length before the bytes are there.
 #include "foundation/Cbor.h"
 
+#include "foundation/CborHead.h"
+
 #include <algorithm>
 #include <array>
 #include <bit>
@@ -12,14 +14,12 @@
 namespace foundation {
 namespace {
 
-enum class Major : std::uint8_t { Unsigned, Negative, Bytes, Text, Array, Map, Tag, Simple };
+using Head = CborHead;
+using Major = CborMajor;
+using enum CborHead::Simple;
 
-constexpr std::uint8_t indefiniteLength = 31;
 constexpr char breakByte = '\xFF';
 constexpr std::uint64_t epochDateTag = 1;
-
-// The values of `additional` in a head of major type 7.
-enum Simple : std::uint8_t { False = 20, True = 21, Null = 22, Float16 = 25, Float32 = 26, Float64 = 27 };
 
 template <typename Integer> void appendBigEndian(Integer value, std::string& out)
 {
@@ -52,7 +52,7 @@ void appendHead(Major major, std::uint64_t argument, std::string& out)
     }
 }
 
-void appendSimple(Simple simple, std::string& out)
+void appendSimple(Head::Simple simple, std::string& out)
 {
     out.push_back(static_cast<char>(static_cast<unsigned>(Major::Simple) << 5 | simple));
 }
@@ -189,13 +189,6 @@ public:
     }
 
 private:
-    struct Head {
-        Major major = Major::Simple;
-        std::uint8_t additional = Null;
-        std::uint64_t argument = 0;
-        [[nodiscard]] bool isIndefinite() const noexcept { return additional == indefiniteLength; }
-    };
-
     void fail(CborError error) noexcept
     {
         if (!error_)
@@ -222,10 +215,8 @@ private:
 
     template <typename Integer> std::uint64_t takeBigEndian() noexcept
     {
-        Integer value = 0;
-        if (const std::string_view bytes = take(sizeof value); !bytes.empty())
-            std::memcpy(&value, bytes.data(), sizeof value);
-        return std::endian::native == std::endian::little ? std::byteswap(value) : value;
+        const std::string_view bytes = take(sizeof(Integer));
+        return bytes.empty() ? 0 : cborBigEndian<Integer>(bytes.data());
     }
 
     std::uint64_t readArgument(std::uint8_t additional) noexcept
@@ -235,7 +226,7 @@ private:
         case 25: return takeBigEndian<std::uint16_t>();
         case 26: return takeBigEndian<std::uint32_t>();
         case 27: return takeBigEndian<std::uint64_t>();
-        case indefiniteLength: return 0;
+        case Head::indefiniteLength: return 0;
         default: break;
         }
         if (additional >= 24)
@@ -273,29 +264,14 @@ private:
     // What is whole with its head: integers and the simple values. Null for all else.
     Value readScalar(const Head& head) noexcept
     {
-        switch (head.major) {
-        case Major::Unsigned:
-            return std::in_range<std::int64_t>(head.argument) ? Value(static_cast<std::int64_t>(head.argument))
-                                                              : Value(head.argument);
-        case Major::Negative:
-            return std::in_range<std::int64_t>(head.argument) ? Value(-1 - static_cast<std::int64_t>(head.argument))
-                                                              : refuse(CborError::IntegerOutOfRange);
-        case Major::Simple: return readSimple(head);
-        default: return {};
-        }
-    }
-
-    Value readSimple(const Head& head) noexcept
-    {
-        switch (head.additional) {
-        case False: return false;
-        case True: return true;
-        case Null: return {};
-        case Float16: return widenHalf(static_cast<std::uint16_t>(head.argument));
-        case Float32: return std::bit_cast<float>(static_cast<std::uint32_t>(head.argument));
-        case Float64: return std::bit_cast<double>(head.argument);
-        default: break;
-        }
+        if (const auto number = cborNumber(head))
+            return *number;
+        if (head.major == Major::Negative)
+            return refuse(CborError::IntegerOutOfRange);
+        if (head.major != Major::Simple || head.additional == Null)
+            return {};
+        if (head.additional == Float16)
+            return widenHalf(static_cast<std::uint16_t>(head.argument));
         const bool wellFormed = head.additional != 24 || head.argument >= 32;
         return refuse(wellFormed ? CborError::Unsupported : CborError::Malformed);
     }

@@ -1,14 +1,15 @@
 // Looking into encoded values without decoding them.
 //
 // A session keeps its messages encoded, and what it derives from them needs a few keys of each of a million
-// messages. Walking over the bytes finds them at a fraction of the cost of unpacking, and without memory.
+// messages. Walking over the bytes finds them at a fraction of the cost of unpacking, and without memory; what every
+// step does is inline.
 // Only for bytes that `appendCbor` wrote: nothing is checked.
 #pragma once
 
+#include "foundation/CborHead.h"
 #include "foundation/Value.h"
 
 #include <cstddef>
-#include <cstdint>
 #include <iterator>
 #include <string>
 #include <string_view>
@@ -18,19 +19,62 @@ namespace foundation {
 // One encoded value. Valid as long as the bytes. Any thread.
 class CborItem {
 public:
+    // No value: it has no bytes and answers nothing else.
     constexpr CborItem() noexcept = default;
     constexpr explicit CborItem(std::string_view bytes) noexcept : bytes_(bytes) { }
+    // The item that stands there, whatever follows it.
+    static CborItem at(const char* place) noexcept { return CborItem({place, sizeAt(place)}); }
 
     [[nodiscard]] std::string_view bytes() const noexcept { return bytes_; }
     [[nodiscard]] Value::Kind kind() const noexcept;
-    // The value's text, of a string only.
-    [[nodiscard]] std::string_view string() const noexcept;
+    // These answer as `Value` does.
+    [[nodiscard]] std::string_view stringView() const noexcept
+    {
+        return kind() == Value::Kind::String ? content() : std::string_view();
+    }
+    [[nodiscard]] std::optional<Number> number() const noexcept { return cborNumber(headAt(bytes_.data()).head); }
+    [[nodiscard]] std::string text() const { return value().text(); }
     // The value unpacked.
     [[nodiscard]] Value value() const;
-    // Appends the value's text, as `Value::appendText` does.
-    void appendText(std::string& out) const;
+    // What stands behind the head: the bytes of a string, the elements of an array, the keys and values of a
+    // dictionary.
+    [[nodiscard]] std::string_view content() const noexcept { return bytes_.substr(headAt(bytes_.data()).size); }
 
 private:
+    struct SizedHead {
+        CborHead head;
+        std::size_t size;
+    };
+
+    static SizedHead headAt(const char* place) noexcept
+    {
+        const auto first = static_cast<std::uint8_t>(*place++);
+        const auto head = [first](std::size_t size, std::uint64_t argument) -> SizedHead {
+            return {{static_cast<CborMajor>(first >> 5), static_cast<std::uint8_t>(first & 0x1F), argument}, size};
+        };
+        switch (first & 0x1F) {
+        case 24: return head(2, cborBigEndian<std::uint8_t>(place));
+        case 25: return head(3, cborBigEndian<std::uint16_t>(place));
+        case 26: return head(5, cborBigEndian<std::uint32_t>(place));
+        case 27: return head(9, cborBigEndian<std::uint64_t>(place));
+        default: return head(1, first & 0x1F);
+        }
+    }
+
+    static std::size_t sizeAt(const char* place) noexcept
+    {
+        const auto [head, size] = headAt(place);
+        switch (head.major) {
+        case CborMajor::Bytes:
+        case CborMajor::Text: return size + head.argument;
+        case CborMajor::Array:
+        case CborMajor::Map:
+        case CborMajor::Tag: return nestedSizeAt(place);
+        default: return size;
+        }
+    }
+    static std::size_t nestedSizeAt(const char* place) noexcept;
+
     std::string_view bytes_;
 };
 
@@ -43,27 +87,25 @@ public:
         using difference_type = std::ptrdiff_t;
 
         Iterator() = default;
-        explicit Iterator(std::string_view rest) : rest_(rest) { readItem(); }
-        CborItem operator*() const noexcept { return item_; }
-        Iterator& operator++()
+        explicit Iterator(std::string_view items) : place_(items.data()), end_(place_ + items.size()) { }
+        CborItem operator*() const noexcept { return CborItem::at(place_); }
+        Iterator& operator++() noexcept
         {
-            readItem();
+            place_ += (**this).bytes().size();
             return *this;
         }
-        void operator++(int) { readItem(); }
+        void operator++(int) noexcept { ++*this; }
         friend bool operator==(const Iterator& iterator, std::default_sentinel_t) noexcept
         {
-            return iterator.item_.bytes().empty();
+            return iterator.place_ == iterator.end_;
         }
 
     private:
-        void readItem();
-
-        std::string_view rest_;
-        CborItem item_;
+        const char* place_ = nullptr;
+        const char* end_ = nullptr;
     };
 
-    explicit CborItems(std::string_view container);
+    explicit CborItems(CborItem container) : items_(container.content()) { }
     [[nodiscard]] Iterator begin() const { return Iterator(items_); }
     [[nodiscard]] static std::default_sentinel_t end() noexcept { return {}; }
 
@@ -72,13 +114,29 @@ private:
 };
 
 // Calls `visit` with key and value of each entry of an encoded dictionary.
-template <typename Visit> void forEachCborEntry(std::string_view dictionary, Visit visit)
+template <typename Visit> void forEachCborEntry(CborItem dictionary, Visit visit)
 {
-    const CborItems items(dictionary);
-    for (auto item = items.begin(); item != items.end(); ++item) {
-        const std::string_view key = (*item).string();
-        ++item;
-        visit(key, *item);
+    const std::string_view content = dictionary.content();
+    const char* const end = content.data() + content.size();
+    for (const char* place = content.data(); place != end;) {
+        const CborItem key = CborItem::at(place);
+        const CborItem value = CborItem::at(place + key.bytes().size());
+        visit(key.content(), value);
+        place = value.bytes().data() + value.bytes().size();
+    }
+}
+
+inline Value::Kind CborItem::kind() const noexcept
+{
+    const CborHead head = headAt(bytes_.data()).head;
+    switch (head.major) {
+    case CborMajor::Bytes: return Value::Kind::Data;
+    case CborMajor::Text: return Value::Kind::String;
+    case CborMajor::Array: return Value::Kind::Array;
+    case CborMajor::Map: return Value::Kind::Dictionary;
+    case CborMajor::Tag: return Value::Kind::Date;
+    case CborMajor::Simple: return head.additional == CborHead::Null ? Value::Kind::Null : Value::Kind::Number;
+    default: return Value::Kind::Number;
     }
 }
 

@@ -24,6 +24,11 @@ struct JsonStringStream {
     void Put(char character) { out.push_back(character); }
     static void Flush() { }
 };
+// RapidJSON finds it for its indents.
+inline void PutN(JsonStringStream& stream, char character, std::size_t count)
+{
+    stream.out.append(count, character);
+}
 
 template <typename RapidWriter> class JsonValueWriter : public RapidWriter {
 public:
@@ -47,8 +52,9 @@ public:
     bool write(CborItem item)
     {
         switch (item.kind()) {
-        case Value::Kind::String: return writeText(item.string());
-        case Value::Kind::Array: return writeArray(CborItems(item.bytes()));
+        case Value::Kind::Number: return writeNumber(*item.number());
+        case Value::Kind::String: return writeText(item.stringView());
+        case Value::Kind::Array: return writeArray(CborItems(item));
         default: return write(item.value());
         }
     }

@@ -3,8 +3,7 @@
 #include "foundation/Number.h"
 
 #include <cmath>
-#include <fmt/format.h>
-#include <iterator>
+#include <fmt/compile.h>
 #include <limits>
 
 namespace foundation {
@@ -64,14 +63,14 @@ std::string Number::text() const
     return text;
 }
 
-void Number::appendText(std::string& out) const
+char* Number::writeText(char* out) const
 {
-    const auto append = [&out](auto value) { fmt::format_to(std::back_inserter(out), "{}", value); };
+    const auto write = [out](auto value) { return fmt::format_to(out, FMT_COMPILE("{}"), value); };
     switch (kind_) {
-    case Kind::Unsigned64: return append(bits_);
-    case Kind::Float32: return append(static_cast<float>(doubleValue()));
-    case Kind::Float64: return append(doubleValue());
-    default: return append(signedBits());
+    case Kind::Unsigned64: return write(bits_);
+    case Kind::Float32: return write(static_cast<float>(doubleValue()));
+    case Kind::Float64: return write(doubleValue());
+    default: return write(signedBits());
     }
 }
 

@@ -5,11 +5,13 @@
 // it sent true before has not said anything new.
 #pragma once
 
+#include <array>
 #include <bit>
 #include <concepts>
 #include <cstdint>
 #include <optional>
 #include <string>
+#include <string_view>
 #include <utility>
 
 namespace foundation {
@@ -43,7 +45,8 @@ public:
     // Integers in decimal, booleans 1 and 0, floats the shortest decimal that reads back to the same
     // value of their kind.
     [[nodiscard]] std::string text() const;
-    void appendText(std::string& out) const;
+    // To whatever appends characters.
+    template <typename Out> void appendText(Out& out) const;
 
     // Equal when the two stand for exactly the same number: true, 1 and 1.0 are equal, 2^53 + 1 and
     // the double 2^53 are not, NaN equals nothing.
@@ -51,6 +54,10 @@ public:
 
 private:
     friend class Value;
+
+    static constexpr std::size_t longestText = 32;
+    // Writes the text to `out`, where there is room for the longest, and returns its end.
+    char* writeText(char* out) const;
 
     constexpr Number(Kind kind, std::uint64_t bits) noexcept : kind_(kind), bits_(bits) { }
     static constexpr std::uint64_t bitsOf(std::int64_t value) noexcept { return static_cast<std::uint64_t>(value); }
@@ -72,6 +79,12 @@ template <std::integral Integer> std::optional<Integer> Number::exactly() const 
     case Kind::Unsigned64: return inRange(bits_);
     default: return std::nullopt;
     }
+}
+
+template <typename Out> void Number::appendText(Out& out) const
+{
+    std::array<char, longestText> text;
+    out.append(std::string_view(text.data(), writeText(text.data())));
 }
 
 } // namespace foundation

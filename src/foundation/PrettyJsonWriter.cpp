@@ -15,14 +15,16 @@ public:
     Implementation(const Implementation&) = delete;
     Implementation& operator=(const Implementation&) = delete;
 
-    void passOnIfLarge()
+    [[nodiscard]] bool isWhole() const { return isWhole_; }
+
+    // Writes with the writer, unless there is no point in it any more.
+    template <typename Write> void write(Write write)
     {
+        isWhole_ = isWhole_ && write(writer_);
         constexpr std::size_t large = std::size_t{64} << 10;
         if (text_.size() >= large)
             passOn();
     }
-
-    JsonValueWriter<RapidWriter>& writer() { return writer_; }
 
 private:
     void passOn()
@@ -34,6 +36,7 @@ private:
     Sink sink_;
     std::string text_;
     JsonValueWriter<RapidWriter> writer_{text_, true};
+    bool isWhole_ = true;
 };
 
 PrettyJsonWriter::PrettyJsonWriter(Sink sink) : implementation_(std::make_unique<Implementation>(std::move(sink))) { }
@@ -41,38 +44,42 @@ PrettyJsonWriter::~PrettyJsonWriter() = default;
 
 void PrettyJsonWriter::beginArray()
 {
-    implementation_->writer().StartArray();
+    implementation_->write([](auto& writer) { return writer.StartArray(); });
 }
 
 void PrettyJsonWriter::endArray()
 {
-    implementation_->writer().EndArray();
+    implementation_->write([](auto& writer) { return writer.EndArray(); });
 }
 
 void PrettyJsonWriter::beginObject()
 {
-    implementation_->writer().StartObject();
+    implementation_->write([](auto& writer) { return writer.StartObject(); });
 }
 
 void PrettyJsonWriter::endObject()
 {
-    implementation_->writer().EndObject();
-    implementation_->passOnIfLarge();
+    implementation_->write([](auto& writer) { return writer.EndObject(); });
 }
 
 void PrettyJsonWriter::key(std::string_view key)
 {
-    implementation_->writer().writeText(key);
+    implementation_->write([key](auto& writer) { return writer.writeText(key); });
 }
 
-bool PrettyJsonWriter::write(const Value& value)
+void PrettyJsonWriter::write(const Value& value)
 {
-    return implementation_->writer().write(value);
+    implementation_->write([&value](auto& writer) { return writer.write(value); });
 }
 
-bool PrettyJsonWriter::write(CborItem item)
+void PrettyJsonWriter::write(CborItem item)
 {
-    return implementation_->writer().write(item);
+    implementation_->write([item](auto& writer) { return writer.write(item); });
+}
+
+bool PrettyJsonWriter::isWhole() const
+{
+    return implementation_->isWhole();
 }
 
 } // namespace foundation

@@ -24,9 +24,12 @@ public:
     void beginObject();
     void endObject();
     void key(std::string_view key);
-    // False when the value holds NaN or infinity, which JSON cannot say; the text is then of no use.
-    [[nodiscard]] bool write(const Value& value);
-    [[nodiscard]] bool write(CborItem item);
+    void write(const Value& value);
+    void write(CborItem item);
+
+    // False once a value held NaN or infinity, which JSON cannot say. What was written is then of no use, and nothing
+    // more is written.
+    [[nodiscard]] bool isWhole() const;
 
 private:
     class Implementation;

@@ -2,24 +2,24 @@
 #include "foundation/String.h"
 
 #include <cstdint>
+#include <cstdlib>
 #include <cstring>
-#include <new>
 
 namespace foundation {
 
 const StringObject* StringObject::create(std::string_view text)
 {
-    void* memory = ::operator new(sizeof(StringObject) + text.size());
-    auto* object = new (memory) StringObject(text.size());
+    void* memory = std::malloc(sizeof(StringObject) + text.size());
+    if (memory == nullptr)
+        throw std::bad_alloc();
     std::memcpy(static_cast<char*>(memory) + sizeof(StringObject), text.data(), text.size());
-    return object;
+    return createIn(memory, text.size());
 }
 
 void StringObject::destroy(const StringObject* object) noexcept
 {
-    const std::size_t size = sizeof(StringObject) + object->size_;
     object->~StringObject();
-    ::operator delete(const_cast<StringObject*>(object), size);
+    std::free(const_cast<StringObject*>(object));
 }
 
 String::String(std::string_view text)

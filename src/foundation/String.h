@@ -9,15 +9,22 @@
 
 #include <compare>
 #include <cstddef>
+#include <new>
 #include <string_view>
 #include <utility>
 
 namespace foundation {
 
-// The characters behind a `String`: length and bytes in one allocation.
+// The characters behind a `String`: length and bytes in one allocation, of `malloc`, so that a `StringBuilder` can
+// have it grown in place.
 class StringObject : public ReferenceCounted {
 public:
     static const StringObject* create(std::string_view text);
+    // Makes memory into an object; the bytes stand there already, behind room for the object.
+    static const StringObject* createIn(void* memory, std::size_t size) noexcept
+    {
+        return new (memory) StringObject(size);
+    }
     static void destroy(const StringObject* object) noexcept;
 
     [[nodiscard]] std::string_view view() const noexcept
@@ -53,6 +60,7 @@ public:
     friend bool operator==(const String& left, std::string_view right) noexcept { return left.view() == right; }
 
 private:
+    friend class StringBuilder;
     friend class Value;
     explicit String(Reference<StringObject> object) noexcept : object_(std::move(object)) { }
 

@@ -1,0 +1,41 @@
+#include "foundation/StringBuilder.h"
+
+#include <algorithm>
+#include <cstdlib>
+#include <new>
+#include <utility>
+
+namespace foundation {
+
+void StringBuilder::Free::operator()(char* memory) const noexcept
+{
+    std::free(memory);
+}
+
+String StringBuilder::finish() &&
+{
+    if (size_ == 0)
+        return {};
+    setCapacity(size_);
+    const std::size_t size = std::exchange(size_, 0);
+    capacity_ = 0;
+    return String(Reference<StringObject>::adopt(StringObject::createIn(memory_.release(), size)));
+}
+
+void StringBuilder::grow(std::size_t additional)
+{
+    constexpr std::size_t smallest = 32;
+    setCapacity(std::max({smallest, size_ + additional, capacity_ * 2}));
+}
+
+void StringBuilder::setCapacity(std::size_t capacity)
+{
+    void* moved = std::realloc(memory_.get(), sizeof(StringObject) + capacity);
+    if (moved == nullptr)
+        throw std::bad_alloc();
+    static_cast<void>(memory_.release());
+    memory_.reset(static_cast<char*>(moved));
+    capacity_ = capacity;
+}
+
+} // namespace foundation
