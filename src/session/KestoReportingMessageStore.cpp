@@ -42,10 +42,8 @@ foundation::Dictionary KestoReportingMessageStore::Payload::dictionary() const
     return foundation::CborItem(encoded_).value().dictionary().value_or(foundation::Dictionary());
 }
 
-KestoReportingMessageStore::KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget,
-                                                       std::span<const std::string_view> markedKeys)
-    : budget_(std::move(budget)),
-      markedKeys_(markedKeys.begin(), markedKeys.end())
+KestoReportingMessageStore::KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget)
+    : budget_(std::move(budget))
 {
 }
 
@@ -62,8 +60,7 @@ KestoReportingMessageStore::Outcome KestoReportingMessageStore::record(AudioEven
     const bool isError = category == AudioEventCategoryError || type == AudioEventTypeError;
     if (!isError && repeatsLast(kind, payload))
         return Outcome::Redundant;
-    const bool isMarked = std::ranges::any_of(markedKeys_, [&](std::string_view key) { return payload.contains(key); });
-    if (!append({number, isMarked, 0}, payload, kind.last))
+    if (!append(number, payload, kind.last))
         return Outcome::Full;
     ++size_;
     ++kind.count;
@@ -91,7 +88,7 @@ std::uint32_t KestoReportingMessageStore::kindOf(AudioEventCategory category, Au
     return found->second;
 }
 
-bool KestoReportingMessageStore::append(Head head, const foundation::Dictionary& payload, Payload& appended)
+bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Dictionary& payload, Payload& appended)
 {
     const std::size_t size = textSize(payload);
     const bool isLarge = size > largestEncoded;
@@ -100,7 +97,7 @@ bool KestoReportingMessageStore::append(Head head, const foundation::Dictionary&
     scratch_.clear();
     if (!isLarge)
         foundation::appendCbor(payload, scratch_);
-    head.size = isLarge ? keptAside : static_cast<std::uint32_t>(scratch_.size());
+    const Head head{kind, isLarge, static_cast<std::uint32_t>(scratch_.size())};
     char* place = allocate(sizeof head + scratch_.size());
     if (place == nullptr) {
         if (isLarge)
@@ -110,7 +107,7 @@ bool KestoReportingMessageStore::append(Head head, const foundation::Dictionary&
     std::memcpy(place, &head, sizeof head);
     std::memcpy(place + sizeof head, scratch_.data(), scratch_.size());
     appended.encoded_ = {place + sizeof head, scratch_.size()};
-    appended.kept_ = isLarge ? &large_.emplace_back(payload) : nullptr;
+    appended.kept_ = isLarge ? &keptAside_.emplace_back(payload) : nullptr;
     return true;
 }
 
@@ -143,13 +140,6 @@ char* KestoReportingMessageStore::allocate(std::size_t bytes)
     char* place = chunk.bytes.get() + chunk.used;
     chunk.used += bytes;
     return place;
-}
-
-KestoReportingMessageStore::Head KestoReportingMessageStore::headAt(const char* place)
-{
-    Head head;
-    std::memcpy(&head, place, sizeof head);
-    return head;
 }
 
 std::string KestoReportingMessageStore::identifier(const Message& message) const

@@ -12,9 +12,9 @@
 #include "utility/KestoReportingVocabulary.h"
 
 #include <cstdint>
+#include <cstring>
 #include <deque>
 #include <memory>
-#include <span>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -22,6 +22,13 @@
 
 // The owner keeps calls apart: one thread at a time.
 class KestoReportingMessageStore {
+    // What stands before each payload in a chunk.
+    struct Head {
+        std::uint32_t kind : 31;
+        std::uint32_t isKeptAside : 1; // in `keptAside_`, and not encoded behind the head
+        std::uint32_t size; // of the encoding
+    };
+
 public:
     enum class Outcome : std::uint8_t {
         Recorded,
@@ -35,11 +42,11 @@ public:
         [[nodiscard]] foundation::Dictionary dictionary() const;
 
         // Calls `visit` with the key and the value of each entry. The value is a `foundation::CborItem` or a
-        // `foundation::Value`; both have `value` or are one, and `appendText`.
+        // `foundation::Value`, which answer the same questions.
         template <typename Visit> void forEach(Visit visit) const
         {
             if (kept_ == nullptr)
-                return foundation::forEachCborEntry(encoded_, visit);
+                return foundation::forEachCborEntry(foundation::CborItem(encoded_), visit);
             for (const auto& [key, value] : *kept_)
                 visit(key.view(), value);
         }
@@ -53,13 +60,10 @@ public:
     struct Message {
         std::uint32_t kind; // its number in `kindKey`
         std::uint64_t index; // from 1 among the messages of its kind
-        bool isMarked; // carries one of the marked keys
         Payload payload;
     };
 
-    // Messages with any of the marked keys are marked, so that they are found again without looking into all.
-    explicit KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget,
-                                        std::span<const std::string_view> markedKeys = {});
+    explicit KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget);
     ~KestoReportingMessageStore();
     KestoReportingMessageStore(const KestoReportingMessageStore&) = delete;
     KestoReportingMessageStore& operator=(const KestoReportingMessageStore&) = delete;
@@ -70,6 +74,26 @@ public:
 
     [[nodiscard]] std::size_t size() const noexcept { return size_; }
     [[nodiscard]] bool empty() const noexcept { return size_ == 0; }
+
+    // Goes over the messages in the order of acceptance; a copy goes on by itself from the same place. Valid as long
+    // as the store records nothing.
+    class Cursor {
+    public:
+        // Stands before the first message.
+        explicit Cursor(const KestoReportingMessageStore& store) : store_(&store) { }
+        // Goes to the next message; false when there is none.
+        bool next();
+        // Of the message that it stands at.
+        [[nodiscard]] std::uint32_t kind() const { return head_.kind; }
+        [[nodiscard]] Payload payload() const;
+
+    private:
+        const KestoReportingMessageStore* store_;
+        std::size_t chunk_ = 0;
+        std::size_t at_ = 0; // in the chunk, behind the message
+        std::size_t keptAside_ = 0; // messages passed
+        Head head_ = {};
+    };
 
     // Calls `visit` with each `Message`, in the order of acceptance.
     template <typename Visit> void forEach(Visit visit) const;
@@ -94,26 +118,16 @@ private:
         std::size_t used = 0;
         std::size_t capacity = 0;
     };
-    // What stands before each payload in a chunk.
-    struct Head {
-        std::uint32_t kind : 31;
-        std::uint32_t isMarked : 1;
-        std::uint32_t size; // of the encoding; `keptAside` for a payload in `large_`
-    };
-    static constexpr std::uint32_t keptAside = 0xFFFFFFFF;
-
     std::uint32_t kindOf(AudioEventCategory category, AudioEventType type);
     [[nodiscard]] static bool repeatsLast(const Kind& kind, const foundation::Dictionary& payload);
-    [[nodiscard]] bool append(Head head, const foundation::Dictionary& payload, Payload& appended);
+    [[nodiscard]] bool append(std::uint32_t kind, const foundation::Dictionary& payload, Payload& appended);
     [[nodiscard]] bool pay(std::size_t bytes);
     void refund(std::size_t bytes);
     [[nodiscard]] char* allocate(std::size_t bytes);
-    static Head headAt(const char* place);
 
     const std::shared_ptr<KestoReportingStorageBudget> budget_;
-    const std::vector<std::string_view> markedKeys_;
     std::vector<Chunk> chunks_;
-    std::deque<foundation::Dictionary> large_;
+    std::deque<foundation::Dictionary> keptAside_;
     std::vector<Kind> kinds_;
     std::unordered_map<std::string, std::uint32_t> kindByKey_;
     std::size_t size_ = 0;
@@ -121,22 +135,33 @@ private:
     std::string scratch_;
 };
 
+inline bool KestoReportingMessageStore::Cursor::next()
+{
+    for (; chunk_ != store_->chunks_.size(); ++chunk_, at_ = 0) {
+        const Chunk& chunk = store_->chunks_[chunk_];
+        if (at_ == chunk.used)
+            continue;
+        std::memcpy(&head_, chunk.bytes.get() + at_, sizeof head_);
+        at_ += sizeof head_ + head_.size;
+        keptAside_ += head_.isKeptAside;
+        return true;
+    }
+    return false;
+}
+
+inline KestoReportingMessageStore::Payload KestoReportingMessageStore::Cursor::payload() const
+{
+    Payload payload;
+    if (head_.isKeptAside)
+        payload.kept_ = &store_->keptAside_[keptAside_ - 1];
+    else
+        payload.encoded_ = {store_->chunks_[chunk_].bytes.get() + at_ - head_.size, head_.size};
+    return payload;
+}
+
 template <typename Visit> void KestoReportingMessageStore::forEach(Visit visit) const
 {
-    std::vector<std::uint64_t> seen(kinds_.size());
-    auto large = large_.begin();
-    for (const Chunk& chunk : chunks_) {
-        for (std::size_t at = 0; at != chunk.used;) {
-            const Head head = headAt(chunk.bytes.get() + at);
-            at += sizeof head;
-            Message message{head.kind, ++seen[head.kind], head.isMarked != 0, {}};
-            if (head.size == keptAside) {
-                message.payload.kept_ = &*large++;
-            } else {
-                message.payload.encoded_ = {chunk.bytes.get() + at, head.size};
-                at += head.size;
-            }
-            visit(static_cast<const Message&>(message));
-        }
-    }
+    std::vector<std::uint64_t> counts(kinds_.size());
+    for (Cursor cursor(*this); cursor.next();)
+        visit(Message{cursor.kind(), ++counts[cursor.kind()], cursor.payload()});
 }

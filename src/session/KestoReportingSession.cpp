@@ -79,7 +79,7 @@ void KestoReportingSession::start()
     messagesLost_ = 0;
     {
         const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        nestedAggregatedPayloadData_ = std::make_unique<KestoReportingMessageStore>(budget_, rapidMessageKeys);
+        nestedAggregatedPayloadData_ = std::make_unique<KestoReportingMessageStore>(budget_);
     }
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStarted);
 }

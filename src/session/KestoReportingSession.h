@@ -12,12 +12,13 @@
 #include "sinks/KestoReportingSinkSession.h"
 #include "utility/KestoReportingError.h"
 
-#include <array>
 #include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
+#include <string_view>
 #include <vector>
 
 // The one value of "KestoReportingTraceType" that lets a trace start. Told by its identity: text that a client
@@ -80,11 +81,8 @@ public:
     [[nodiscard]] static std::vector<foundation::Dictionary>
     combineRapidMessages(const KestoReportingMessageStore& messages, std::span<const std::string_view> keysToCombine,
                          double maximumPausetime);
-    // The keys of the switches that arrive in bursts; what the volume analysis folds. Sessions mark their messages.
-    static constexpr std::array<std::string_view, 2> rapidMessageKeys{"spatial-audio-accessory-feature",
-                                                                      "spatializationEnabled"};
-    // One event for each stretch of more than so many seconds during which output ran unchanged. The messages are
-    // marked by `rapidMessageKeys`. Without a process there are none.
+    // One event for each stretch of more than so many seconds during which output ran unchanged. Without a process
+    // there are none.
     [[nodiscard]] static std::vector<foundation::Dictionary>
     createVolumeMessages(const KestoReportingMessageStore& messages, const std::optional<foundation::Value>& process,
                          double minimumPlaytime);

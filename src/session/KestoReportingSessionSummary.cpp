@@ -4,6 +4,7 @@
 #include "foundation/Format.h"
 #include "foundation/LocalTime.h"
 #include "foundation/PrettyJsonWriter.h"
+#include "foundation/StringBuilder.h"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
 #include "utility/KestoReportingUtility.h"
@@ -25,26 +26,29 @@ public:
     template <typename Item> void append(std::string_view key, const Item& value)
     {
         const bool isFirst = !moveTo(key);
-        std::string& text = values_[position_].text;
+        foundation::StringBuilder& text = values_[position_].text;
         if (!isFirst)
-            text += ',';
-        value.appendText(text);
+            text.append(',');
+        if (const auto number = value.number())
+            number->appendText(text);
+        else if (value.kind() == foundation::Value::Kind::String)
+            text.append(value.stringView());
+        else
+            text.append(value.text());
     }
 
     Dictionary finish() &&
     {
         Dictionary::Entries entries;
-        for (auto& [key, text] : values_) {
-            entries.push_back({key, std::string_view(text)});
-            text = std::string(); // a long session's texts are not in memory twice
-        }
+        for (auto& [key, text] : values_)
+            entries.push_back({key, std::move(text).finish()});
         return entries;
     }
 
 private:
     struct Values {
         foundation::String key;
-        std::string text;
+        foundation::StringBuilder text;
     };
 
     // False when the key is new. Keys come in the same order in nearly every message: the next one is tried first.
@@ -64,14 +68,19 @@ private:
     std::size_t position_ = 0;
 };
 
-// What a client chose, made fit to be part of a file name: it can neither leave the directory nor be too long for
-// the file system, which takes 255 bytes a name.
-std::string fileNamePart(std::string_view text)
+// What a client chose, made fit to be part of a file name: it cannot leave the directory, and whole characters of it
+// take no more bytes than there is room for.
+std::string fileNamePart(std::string_view text, std::size_t room)
 {
-    constexpr std::size_t longestPart = 160;
-    std::string part(text.substr(0, longestPart));
-    while (!part.empty() && !foundation::isValidUtf8(part)) // cut inside a character
-        part.pop_back();
+    const auto isInsideCharacter = [text](std::size_t at) {
+        return (static_cast<unsigned char>(text[at]) & 0xC0) == 0x80;
+    };
+    if (room < text.size()) {
+        while (room > 0 && isInsideCharacter(room))
+            --room;
+        text = text.substr(0, room);
+    }
+    std::string part(text);
     for (char& character : part)
         if (character == '/' || character == '\0')
             character = '_';
@@ -82,7 +91,6 @@ std::string fileNamePart(std::string_view text)
 bool writeJson(const KestoReportingMessageStore& store, foundation::PrettyJsonWriter::Sink sink)
 {
     foundation::PrettyJsonWriter writer(std::move(sink));
-    bool isComplete = true;
     writer.beginArray();
     store.forEach([&](const KestoReportingMessageStore::Message& message) {
         writer.beginObject();
@@ -90,13 +98,13 @@ bool writeJson(const KestoReportingMessageStore& store, foundation::PrettyJsonWr
         writer.beginObject();
         message.payload.forEach([&](std::string_view key, const auto& value) {
             writer.key(key);
-            isComplete &= writer.write(value);
+            writer.write(value);
         });
         writer.endObject();
         writer.endObject();
     });
     writer.endArray();
-    return isComplete;
+    return writer.isWhole();
 }
 
 } // namespace
@@ -150,9 +158,12 @@ void KestoReportingSession::writeSummaryJson() const
 
 std::string KestoReportingSession::summaryFileName() const
 {
+    constexpr std::size_t longestName = 255; // of any file system
     const std::string time =
         foundation::localTimeText(platform::current().clock.secondsSince1970(), "{:%Y%m%d-%H%M%S%z}");
+    const std::string beginning = foundation::format("{}-kesto-", time);
+    const std::string end =
+        foundation::format("-{}.json", KestoReportingUtilityGenerateServiceNameFromServiceType(serviceType_));
     const std::string application = KestoReportingUtilityRetrieveAppName(configuration()).text();
-    return foundation::format("{}-kesto-{}-{}.json", time, fileNamePart(application),
-                              KestoReportingUtilityGenerateServiceNameFromServiceType(serviceType_));
+    return beginning + fileNamePart(application, longestName - beginning.size() - end.size()) + end;
 }

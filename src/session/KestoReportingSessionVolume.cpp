@@ -1,7 +1,7 @@
 // What a session's messages tell about its playing: the messages are replayed in order, and each stretch during
 // which output ran in one and the same way becomes a volume event.
 //
-// Switches arrive in bursts; a burst is folded into one payload first, at the place of its first message.
+// The switches of spatial audio arrive in bursts, which are folded into one payload first.
 #define KESTO_LOG_FILE "KestoReportingSession"
 #include "session/KestoReportingRapidMessages.h"
 #include "session/KestoReportingSession.h"
@@ -18,14 +18,40 @@ using Fields = KestoReportingVolumeFields;
 using Key = KestoReportingVolumeKey;
 
 constexpr std::string_view functionName = "+[KestoReportingSession createVolumeMessages:process:minimumPlaytime:]";
-constexpr double maximumPauseTime = 2.0;
+constexpr double longestPause = 2.0; // seconds, within a burst
 
-std::optional<double> timeOf(const Fields& fields)
-{
-    if (!fields.has(Key::Timestamp))
-        return std::nullopt;
-    return fields.value(Key::Timestamp).asDouble();
-}
+// What folding bursts needs to know of the payloads as the analysis sees them.
+struct VolumePayloads {
+    KestoReportingVolumeFieldsReader reader;
+
+    Fields read(const KestoReportingMessageStore::Payload& payload) { return reader.read(payload); }
+    static bool isCombinable(const Fields& payload)
+    {
+        return payload.has(Key::SpatialAudioAccessoryFeature) || payload.has(Key::SpatializationEnabled);
+    }
+    static std::optional<double> timeOf(const Fields& payload)
+    {
+        return payload.has(Key::Timestamp) ? std::optional(payload.number(Key::Timestamp).doubleValue()) : std::nullopt;
+    }
+    static void merge(Fields& into, const Fields& payload) { into.merge(payload); }
+};
+
+// The same of whole payloads, for any keys.
+struct WholePayloads {
+    std::span<const std::string_view> keysToCombine;
+
+    static Dictionary read(const KestoReportingMessageStore::Payload& payload) { return payload.dictionary(); }
+    [[nodiscard]] bool isCombinable(const Dictionary& payload) const
+    {
+        return std::ranges::any_of(keysToCombine, [&](std::string_view key) { return payload.contains(key); });
+    }
+    static std::optional<double> timeOf(const Dictionary& payload)
+    {
+        const Value* time = payload.find(KestoReportingTimestampKey);
+        return time == nullptr ? std::nullopt : std::optional(time->asDouble());
+    }
+    static void merge(Dictionary& into, const Dictionary& payload) { into = into.mergedWith(payload); }
+};
 
 // Replays payloads and gathers the events of the stretches that end.
 class VolumeAnalysis {
@@ -45,11 +71,11 @@ public:
 
     void process(const Fields& payload)
     {
-        const double time = timeOf(payload).value_or(0);
-        const bool wasRunning = state_.value(Key::OutputRunning).asBoolean();
+        const double time = payload.number(Key::Timestamp).doubleValue();
+        const bool wasRunning = state_.boolean(Key::OutputRunning);
         bool isChanged = payload.has(Key::Duration);
         if (payload.has(Key::OutputRunning)) {
-            isRunning_ = payload.value(Key::OutputRunning).asBoolean();
+            isRunning_ = payload.boolean(Key::OutputRunning);
             if (!wasRunning && isRunning_)
                 segmentStart_ = time;
             isChanged |= wasRunning && !isRunning_;
@@ -68,9 +94,14 @@ public:
     // The events, each with their number.
     std::vector<Dictionary> finish() &&
     {
-        for (Dictionary& event : events_)
-            event = event.with("msgcnt", events_.size());
-        return std::move(events_);
+        static const foundation::String countKey("msgcnt");
+        std::vector<Dictionary> events;
+        events.reserve(events_.size());
+        for (Dictionary::Entries& event : events_) {
+            event.push_back({countKey, events_.size()});
+            events.emplace_back(std::move(event));
+        }
+        return events;
     }
 
 private:
@@ -89,10 +120,7 @@ private:
 
     [[nodiscard]] bool changesNumber(const Fields& payload, Key key) const
     {
-        const auto numberOf = [](const Value& value) {
-            return value.number().value_or(foundation::Number(value.asDouble()));
-        };
-        return payload.has(key) && numberOf(payload.value(key)) != numberOf(state_.value(key));
+        return payload.has(key) && payload.number(key) != state_.number(key);
     }
 
     [[nodiscard]] bool changesVolume(const Fields& payload) const
@@ -114,7 +142,7 @@ private:
                   "added volume message {{ func={}, action=add, count={} }}", functionName, events_.size());
     }
 
-    [[nodiscard]] Dictionary makeEvent(double playTime) const
+    [[nodiscard]] Dictionary::Entries makeEvent(double playTime) const
     {
         const auto bucketed = [](double number, std::span<const double> buckets, unsigned places) {
             return Value(KestoReportingUtilityBucketNumberToString(number, buckets, places).value_or(""));
@@ -122,19 +150,20 @@ private:
         const auto fromState = [this](Key key) {
             return Dictionary::Entry{KestoReportingVolumeKeyName(key), state_.value(key)};
         };
-        return {fromState(Key::SelectedFormat),
-                fromState(Key::ActiveDevices),
-                {KestoReportingHostApplicationKey, *process_},
-                fromState(Key::Volume),
-                {"PomoSessionVolumeBucketed",
-                 bucketed(state_.value(Key::Volume).asDouble(), KestoReportingUtilityBucketNumberToStringVolumes, 4)},
-                {"play_seconds", static_cast<float>(playTime)},
-                fromState(Key::SpatialAudioAccessoryFeature),
-                fromState(Key::SpatializationEnabled),
-                fromState(Key::RingerState),
-                fromState(Key::ChannelsPerFrame),
-                {"play_secondsBucketed", bucketed(playTime, KestoReportingUtilityBucketNumberToStringTimes, 0)},
-                {"msgidx", events_.size() + 1}};
+        return {
+            fromState(Key::SelectedFormat),
+            fromState(Key::ActiveDevices),
+            {KestoReportingHostApplicationKey, *process_},
+            fromState(Key::Volume),
+            {"PomoSessionVolumeBucketed",
+             bucketed(state_.number(Key::Volume).doubleValue(), KestoReportingUtilityBucketNumberToStringVolumes, 4)},
+            {"play_seconds", static_cast<float>(playTime)},
+            fromState(Key::SpatialAudioAccessoryFeature),
+            fromState(Key::SpatializationEnabled),
+            fromState(Key::RingerState),
+            fromState(Key::ChannelsPerFrame),
+            {"play_secondsBucketed", bucketed(playTime, KestoReportingUtilityBucketNumberToStringTimes, 0)},
+            {"msgidx", events_.size() + 1}};
     }
 
     const std::optional<Value>& process_;
@@ -143,30 +172,8 @@ private:
     Fields state_;
     bool isRunning_ = false;
     std::optional<double> segmentStart_;
-    std::vector<Dictionary> events_;
+    std::vector<Dictionary::Entries> events_;
 };
-
-// The bursts of a store: which burst each of their messages belongs to, in order, and what it folds into.
-struct Bursts {
-    std::vector<std::size_t> memberOf;
-    std::vector<Fields> folded;
-};
-
-Bursts findBursts(const KestoReportingMessageStore& messages, KestoReportingVolumeFieldsReader& reader)
-{
-    Bursts bursts;
-    KestoReportingBurstFinder finder(maximumPauseTime);
-    messages.forEach([&](const KestoReportingMessageStore::Message& message) {
-        if (!message.isMarked)
-            return;
-        const Fields fields = reader.read(message.payload);
-        const std::size_t burst = finder.burstOf(timeOf(fields));
-        bursts.memberOf.push_back(burst);
-        bursts.folded.resize(std::max(bursts.folded.size(), burst + 1));
-        bursts.folded[burst].merge(fields);
-    });
-    return bursts;
-}
 
 } // namespace
 
@@ -174,23 +181,11 @@ std::vector<Dictionary> KestoReportingSession::combineRapidMessages(const KestoR
                                                                     std::span<const std::string_view> keysToCombine,
                                                                     double maximumPausetime)
 {
-    std::vector<Dictionary::Entries> combined;
-    std::vector<std::size_t> placeOfBurst;
-    KestoReportingBurstFinder finder(maximumPausetime);
-    messages.forEach([&](const KestoReportingMessageStore::Message& message) {
-        const Dictionary payload = message.payload.dictionary();
-        std::size_t place = combined.size();
-        if (std::ranges::any_of(keysToCombine, [&](std::string_view key) { return payload.contains(key); })) {
-            const foundation::Value* time = payload.find(KestoReportingTimestampKey);
-            const std::size_t burst = finder.burstOf(time == nullptr ? std::nullopt : std::optional(time->asDouble()));
-            if (burst == placeOfBurst.size())
-                placeOfBurst.push_back(place);
-            place = placeOfBurst[burst];
-        }
-        combined.resize(std::max(combined.size(), place + 1));
-        combined[place].insert(combined[place].end(), payload.begin(), payload.end());
-    });
-    return {std::make_move_iterator(combined.begin()), std::make_move_iterator(combined.end())};
+    std::vector<Dictionary> combined;
+    WholePayloads payloads{keysToCombine};
+    KestoReportingCombineRapidMessages(messages, maximumPausetime, payloads,
+                                       [&](const Dictionary& payload) { combined.push_back(payload); });
+    return combined;
 }
 
 std::vector<Dictionary> KestoReportingSession::createVolumeMessages(const KestoReportingMessageStore& messages,
@@ -198,17 +193,10 @@ std::vector<Dictionary> KestoReportingSession::createVolumeMessages(const KestoR
                                                                     double minimumPlaytime)
 {
     KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Debug, "entering createVolumeMessages {}", functionName);
-    KestoReportingVolumeFieldsReader reader;
-    const Bursts bursts = findBursts(messages, reader);
+    VolumePayloads payloads;
     VolumeAnalysis analysis(process, minimumPlaytime);
-    std::size_t member = 0;
-    std::size_t burstsSeen = 0;
-    messages.forEach([&](const KestoReportingMessageStore::Message& message) {
-        if (!message.isMarked)
-            return analysis.process(reader.read(message.payload));
-        if (bursts.memberOf[member++] == burstsSeen)
-            analysis.process(bursts.folded[burstsSeen++]);
-    });
+    KestoReportingCombineRapidMessages(messages, longestPause, payloads,
+                                       [&](const Fields& payload) { analysis.process(payload); });
     auto events = std::move(analysis).finish();
     KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Debug,
               "returning volume message {{ func={}, action=return, count={} }}", functionName, events.size());

@@ -48,6 +48,22 @@ std::string_view KestoReportingVolumeKeyName(KestoReportingVolumeKey key)
     return names[static_cast<std::size_t>(key)];
 }
 
+foundation::Number KestoReportingVolumeFields::number(Key key) const
+{
+    if (!has(key))
+        return {};
+    const auto number = item(key).number();
+    return number ? *number : foundation::Number(value(key).asDouble());
+}
+
+bool KestoReportingVolumeFields::boolean(Key key) const
+{
+    if (!has(key))
+        return false;
+    const auto number = item(key).number();
+    return number ? number->booleanValue() : value(key).asBoolean();
+}
+
 void KestoReportingVolumeFields::merge(const KestoReportingVolumeFields& other)
 {
     for (std::size_t index = 0; index < items_.size(); ++index)

@@ -38,6 +38,9 @@ public:
     [[nodiscard]] bool has(Key key) const { return !item(key).bytes().empty(); }
     // The entry's value; null when there is none.
     [[nodiscard]] foundation::Value value(Key key) const { return has(key) ? item(key).value() : foundation::Value(); }
+    // The value as it counts where a number or a truth value is asked for.
+    [[nodiscard]] foundation::Number number(Key key) const;
+    [[nodiscard]] bool boolean(Key key) const;
     // Whether both are the same bytes, and so surely equal text.
     [[nodiscard]] bool isSameEncoding(const KestoReportingVolumeFields& other, Key key) const
     {
