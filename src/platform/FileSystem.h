@@ -1,4 +1,4 @@
-// The few things that the service does with files of its own.
+// The few things that the service does with files of its own, all of them below one folder.
 #pragma once
 
 #include <expected>
@@ -21,13 +21,14 @@ public:
     [[nodiscard]] virtual std::expected<void, std::error_code> commit() = 0;
 };
 
-// Any thread.
+// Paths lie below the diagnostic-log root; others are errors. Any thread.
 class FileSystem {
 public:
     virtual ~FileSystem() = default;
-    // The folder below which diagnostic files are kept.
+    // The folder below which diagnostic files are kept. It exists.
     [[nodiscard]] virtual std::filesystem::path diagnosticLogRoot() const = 0;
-    // Makes the folder and those above it that are missing, with exactly these permissions whatever the umask.
+    // Makes the folder and those above it that are missing, with exactly these permissions whatever the umask. Those
+    // that exist stay as they are.
     [[nodiscard]] virtual std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
                                                                                  unsigned permissions) = 0;
     [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>

@@ -1,11 +1,10 @@
 #include "platform/linux/LinuxFileSystem.h"
 
-#include "platform/linux/FileDescriptor.h"
+#include "foundation/Format.h"
 
 #include <cerrno>
-#include <cstdio>
 #include <fcntl.h>
-#include <fmt/format.h>
+#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -19,16 +18,17 @@ std::error_code lastError()
 
 class LinuxAtomicFile final : public AtomicFile {
 public:
-    LinuxAtomicFile(FileDescriptor file, std::filesystem::path temporaryPath, std::filesystem::path path)
-        : file_(std::move(file)),
-          temporaryPath_(std::move(temporaryPath)),
-          path_(std::move(path))
+    LinuxAtomicFile(FileDescriptor directory, FileDescriptor file, std::string temporaryName, std::string name)
+        : directory_(std::move(directory)),
+          file_(std::move(file)),
+          temporaryName_(std::move(temporaryName)),
+          name_(std::move(name))
     {
     }
     ~LinuxAtomicFile() override
     {
         if (!isCommitted_)
-            ::unlink(temporaryPath_.c_str());
+            ::unlinkat(directory_.get(), temporaryName_.c_str(), 0);
     }
     LinuxAtomicFile(const LinuxAtomicFile&) = delete;
     LinuxAtomicFile& operator=(const LinuxAtomicFile&) = delete;
@@ -52,7 +52,7 @@ public:
 
     std::expected<void, std::error_code> commit() override
     {
-        if (!error_ && std::rename(temporaryPath_.c_str(), path_.c_str()) != 0)
+        if (!error_ && ::renameat(directory_.get(), temporaryName_.c_str(), directory_.get(), name_.c_str()) != 0)
             error_ = lastError();
         isCommitted_ = !error_;
         if (error_)
@@ -61,31 +61,60 @@ public:
     }
 
 private:
+    const FileDescriptor directory_;
     const FileDescriptor file_;
-    const std::filesystem::path temporaryPath_;
-    const std::filesystem::path path_;
+    const std::string temporaryName_;
+    const std::string name_;
     std::error_code error_;
     bool isCommitted_ = false;
 };
 
+// Hidden, and not to be foreseen by who would like to be there first.
+std::string temporaryFileName()
+{
+    std::uint64_t number = 0;
+    if (::getrandom(&number, sizeof number, 0) != sizeof number)
+        number = static_cast<std::uint64_t>(::getpid());
+    return foundation::format(".kestod-{:016x}.tmp", number);
+}
+
 } // namespace
+
+template <typename Step>
+std::expected<FileDescriptor, std::error_code> LinuxFileSystem::openDirectory(const std::filesystem::path& path,
+                                                                              Step step) const
+{
+    const std::filesystem::path below = path.lexically_relative(diagnosticLogRoot_);
+    if (below.empty() || *below.begin() == "..")
+        return std::unexpected(std::make_error_code(std::errc::invalid_argument));
+    FileDescriptor directory(::open(diagnosticLogRoot_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    if (!directory)
+        return std::unexpected(lastError());
+    for (const std::filesystem::path& name : below) {
+        if (std::expected<void, std::error_code> stepped = step(directory.get(), name.c_str()); !stepped)
+            return std::unexpected(stepped.error());
+        FileDescriptor next(::openat(directory.get(), name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+        if (!next)
+            return std::unexpected(lastError());
+        directory = std::move(next);
+    }
+    return directory;
+}
 
 std::expected<void, std::error_code> LinuxFileSystem::createDirectories(const std::filesystem::path& path,
                                                                         unsigned permissions)
 {
-    if (path.has_relative_path() && path != path.parent_path())
-        if (struct stat above; ::stat(path.parent_path().c_str(), &above) != 0)
-            if (auto made = createDirectories(path.parent_path(), permissions); !made)
-                return made;
-    if (::mkdir(path.c_str(), permissions) == 0) { // less the umask, which is the process's and not to be touched
-        if (::chmod(path.c_str(), permissions) != 0)
+    const auto make = [permissions](int parent, const char* name) -> std::expected<void, std::error_code> {
+        if (::mkdirat(parent, name, permissions) == 0) { // less the umask, which is the process's and not to be touched
+            if (::fchmodat(parent, name, permissions, AT_SYMLINK_NOFOLLOW) != 0)
+                return std::unexpected(lastError());
+        } else if (errno != EEXIST) {
             return std::unexpected(lastError());
+        }
         return {};
-    }
-    if (errno != EEXIST)
-        return std::unexpected(lastError());
-    if (struct stat found; ::stat(path.c_str(), &found) != 0 || !S_ISDIR(found.st_mode))
-        return std::unexpected(std::make_error_code(std::errc::not_a_directory));
+    };
+    if (auto opened = openDirectory(path, make); !opened)
+        return std::unexpected(opened.error());
     return {};
 }
 
@@ -93,13 +122,17 @@ std::expected<std::unique_ptr<AtomicFile>, std::error_code>
 LinuxFileSystem::createAtomically(const std::filesystem::path& path)
 {
     constexpr mode_t readableByAll = 0644;
-    const std::filesystem::path temporaryPath = path.parent_path() / fmt::format(".kestod-{}.tmp", ::getpid());
-    ::unlink(temporaryPath.c_str()); // of a process of this number that was killed
+    const auto pass = [](int, const char*) -> std::expected<void, std::error_code> { return {}; };
+    auto directory = openDirectory(path.parent_path(), pass);
+    if (!directory)
+        return std::unexpected(directory.error());
+    std::string name = temporaryFileName();
     FileDescriptor file(
-        ::open(temporaryPath.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByAll));
-    if (file.get() < 0)
+        ::openat(directory->get(), name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByAll));
+    if (!file)
         return std::unexpected(lastError());
-    return std::make_unique<LinuxAtomicFile>(std::move(file), temporaryPath, path);
+    return std::make_unique<LinuxAtomicFile>(*std::move(directory), std::move(file), std::move(name),
+                                             path.filename().string());
 }
 
 } // namespace platform

@@ -1,10 +1,16 @@
 // Folders and files of the service's own, on the real file system.
 //
 // A file is written under a name of its own beside its place and then renamed, so that whoever reads it sees the
-// old one or the new one and never half of it. Links are not followed where a file is made.
+// old one or the new one and never half of it.
+//
+// Some folders may be written to by everybody, and what stands there is not to be trusted: a link put in the place of a
+// folder would have the service write, or open to everybody, where its maker may not. So every step below the
+// diagnostic-log root is taken from the folder before it, and none through a link. The root itself may be one: it is
+// the administrator's.
 #pragma once
 
 #include "platform/FileSystem.h"
+#include "platform/linux/FileDescriptor.h"
 
 namespace platform {
 
@@ -22,6 +28,11 @@ public:
     createAtomically(const std::filesystem::path& path) override;
 
 private:
+    // Calls `step` with the folder before it and its name for each folder on the way, before it is opened.
+    template <typename Step>
+    [[nodiscard]] std::expected<FileDescriptor, std::error_code> openDirectory(const std::filesystem::path& path,
+                                                                               Step step) const;
+
     const std::filesystem::path diagnosticLogRoot_;
 };
 
