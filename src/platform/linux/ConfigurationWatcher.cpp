@@ -9,6 +9,7 @@
 #include <sys/eventfd.h>
 #include <sys/inotify.h>
 #include <system_error>
+#include <utility>
 
 namespace platform {
 namespace {
@@ -52,21 +53,23 @@ std::unique_ptr<ConfigurationWatcher::Watch> ConfigurationWatcher::watch(const f
     std::unique_ptr<Watch> watch(new Watch(*this, directory, changes, std::move(handler)));
     const foundation::Lock lock(lock_);
     watches_.push_back(watch.get());
-    start();
-    armFor(directory);
+    if (start())
+        armFor(directory);
     return watch;
 }
 
-void ConfigurationWatcher::start()
+// With the first watch. False when the kernel refuses.
+bool ConfigurationWatcher::start()
 {
-    if (inotify_)
-        return;
-    inotify_ = FileDescriptor(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
-    stop_ = FileDescriptor(::eventfd(0, EFD_CLOEXEC));
-    if (inotify_ && stop_)
-        thread_ = startThread("configuration", QualityOfService::Default, [this] { run(); });
-    else
-        complain("inotify", errno);
+    if (!std::exchange(isStarted_, true)) {
+        inotify_ = FileDescriptor(::inotify_init1(IN_CLOEXEC | IN_NONBLOCK));
+        stop_ = FileDescriptor(inotify_ ? ::eventfd(0, EFD_CLOEXEC) : -1);
+        if (stop_)
+            thread_ = startThread("configuration", QualityOfService::Default, [this] { run(); });
+        else
+            complain("inotify", errno);
+    }
+    return thread_.joinable();
 }
 
 // Anew for everything that is watched: directories are few, and what became of them is not worth telling apart.

@@ -80,7 +80,7 @@ private:
         std::set<std::string, std::less<>> awaited;
     };
 
-    void start() KESTO_REQUIRES(lock_);
+    [[nodiscard]] bool start() KESTO_REQUIRES(lock_);
     void arm() KESTO_REQUIRES(lock_);
     void armFor(const std::filesystem::path& directory) KESTO_REQUIRES(lock_);
     Place* add(std::filesystem::path& directory, std::string& missing) KESTO_REQUIRES(lock_);
@@ -95,6 +95,7 @@ private:
     foundation::Mutex lock_; // held while handlers run
     std::list<Watch*> watches_ KESTO_GUARDED_BY(lock_);
     std::map<int, Place> places_ KESTO_GUARDED_BY(lock_); // by inotify's watch descriptor
+    bool isStarted_ KESTO_GUARDED_BY(lock_) = false;
     FileDescriptor inotify_;
     FileDescriptor stop_;
     std::thread thread_;

@@ -104,9 +104,11 @@ std::set<std::string> LinuxPreferences::domainsThatAreThere() const
 {
     std::set<std::string> domains;
     std::error_code error;
-    for (std::filesystem::directory_iterator file(directory_, error); file != end(file); file.increment(error))
-        if (const auto domain = domainOf(file->path().filename().native()))
+    for (std::filesystem::directory_iterator file(directory_, error); file != end(file); file.increment(error)) {
+        const std::string fileName = file->path().filename();
+        if (const auto domain = domainOf(fileName))
             domains.emplace(*domain);
+    }
     return domains;
 }
 

@@ -1,0 +1,57 @@
+// A directory for one test, gone with everything in it when the test is over.
+#pragma once
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <stdexcept>
+#include <string>
+#include <string_view>
+
+namespace support {
+
+class TemporaryDirectory {
+public:
+    TemporaryDirectory()
+    {
+        std::string pattern = std::filesystem::temp_directory_path() / "kesto-test-XXXXXX";
+        if (::mkdtemp(pattern.data()) == nullptr)
+            throw std::runtime_error("no temporary directory");
+        path_ = pattern;
+    }
+    ~TemporaryDirectory()
+    {
+        std::error_code ignored;
+        std::filesystem::remove_all(path_, ignored);
+    }
+    TemporaryDirectory(const TemporaryDirectory&) = delete;
+    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
+
+    [[nodiscard]] const std::filesystem::path& path() const noexcept { return path_; }
+
+private:
+    std::filesystem::path path_;
+};
+
+inline void writeFile(const std::filesystem::path& path, std::string_view text)
+{
+    std::ofstream(path, std::ios::binary) << text;
+}
+
+inline void replaceFile(const std::filesystem::path& path, std::string_view text)
+{
+    auto temporary = path;
+    temporary += ".new";
+    writeFile(temporary, text);
+    std::filesystem::rename(temporary, path);
+}
+
+inline std::string readFile(const std::filesystem::path& path)
+{
+    std::ostringstream text;
+    text << std::ifstream(path, std::ios::binary).rdbuf();
+    return text.str();
+}
+
+} // namespace support
