@@ -1,0 +1,26 @@
+// One line of `kesto client`: a JSON array that names an operation and its arguments.
+#pragma once
+
+#include <cstdint>
+#include <expected>
+#include <kesto/kesto.hpp>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+struct Call {
+    kesto::Operation operation = kesto::Operation::GetAllReporters;
+    kesto::ReporterID reporter = 0;
+    kesto::ServiceType serviceType = kesto::ServiceType::Generic;
+    kesto::Category category = kesto::Category::Generic;
+    kesto::EventType type = kesto::EventType::Unknown;
+    std::optional<std::vector<kesto::ReporterID>> reporters = std::nullopt; // none: all started sessions
+    kesto::Message message = {}; // or the configuration
+};
+
+// The call, or what is wrong with the line and what was expected.
+[[nodiscard]] std::expected<Call, std::string> parseCall(std::string_view line);
+
+// The operation's name, as it is printed: the first keyword of the service's own.
+[[nodiscard]] std::string_view operationName(kesto::Operation operation);

@@ -1,0 +1,15 @@
+// The subcommands of `kesto`, a file each. One that is chosen runs after the command line was read and sets the
+// exit status.
+#pragma once
+
+#include <CLI/App.hpp>
+#include <CLI/Config.hpp>
+#include <CLI/Formatter.hpp>
+
+// Exit statuses; a wrong command line is 2.
+constexpr int exitOk = 0;
+constexpr int exitFailure = 1;
+constexpr int exitUsage = 2;
+
+void addClientCommand(CLI::App& application, int& exitStatus);
+void addEventsCommand(CLI::App& application, int& exitStatus);
