@@ -1,0 +1,207 @@
+// What sending costs the thread that calls libkesto, which may be a real-time thread: time, and system calls, which
+// there must not be any of. The peer is what a program would do without the library: writing as many bytes to a
+// socket itself.
+#include "Groups.h"
+#include "SampleMessage.h"
+#include "ServiceProcess.h"
+
+#include <array>
+#include <csignal>
+#include <cstddef>
+#include <fmt/format.h>
+#include <kesto/kesto.hpp>
+#include <linux/filter.h>
+#include <linux/seccomp.h>
+#include <stdexcept>
+#include <sys/prctl.h>
+#include <sys/socket.h>
+#include <sys/syscall.h>
+#include <thread>
+#include <unistd.h>
+
+namespace bench {
+namespace {
+
+constexpr std::size_t burst = 256; // messages that the client's queue takes at once
+constexpr std::size_t bursts = 100;
+
+void check(kesto::Status status)
+{
+    if (status != kesto::Status::Ok)
+        throw std::runtime_error(fmt::format("libkesto: {}", kesto::errorText(status)));
+}
+
+// A program that reports, with the sample session started.
+class Reporter {
+public:
+    explicit Reporter(const ServiceProcess& service)
+    {
+        (void)service.connect(); // once it listens
+        kesto::Options options;
+        options.socketPath = service.socketPath();
+        check(client_.open(options));
+        check(client_.createSession(sampleReporterID));
+        check(client_.startSession(sampleReporterID));
+        settle();
+    }
+
+    // Fills the message in anew, with the next number.
+    void build()
+    {
+        message_.clear()
+            .add("session_output_running", true)
+            .add("session_selected_format", "lpcm, 48 kHz, 24 bit")
+            .add("mChannelsPerFrame", 2)
+            .add("active_devices", "Built-in Speakers")
+            .add("PomoSessionVolume", 0.8125)
+            .add("kestoreporting_timestamp", 1'767'225'600.25)
+            .add("systemuptime_sec", 86'523)
+            .add("spatializationEnabled", false)
+            .add("ringerstate", true)
+            .add("frames_rendered", number_++);
+    }
+    void send() { check(client_.send(message_, kesto::Category::Playback, kesto::EventType::Start, sampleReporterID)); }
+    // Waits until all messages are answered.
+    void settle()
+    {
+        const auto isSettled = [this] {
+            const auto counts = client_.statistics();
+            return client_.state() == kesto::State::Connected && counts.answered == counts.queued;
+        };
+        constexpr std::chrono::seconds patience(10);
+        for (const auto start = Clock::now(); !isSettled(); std::this_thread::sleep_for(std::chrono::milliseconds(1)))
+            if (Clock::now() - start > patience)
+                throw std::runtime_error("libkesto's messages are not answered");
+    }
+
+private:
+    kesto::Client client_;
+    kesto::Message message_;
+    std::uint32_t number_ = numberMark;
+};
+
+// --- System calls
+
+volatile std::sig_atomic_t systemCalls = 0;
+
+void countSystemCall(int, siginfo_t*, void*)
+{
+    systemCalls = systemCalls + 1;
+}
+
+// From now on each system call of this thread is refused and counted, but for the one that ends the thread.
+void trapSystemCalls()
+{
+    struct sigaction action = {};
+    action.sa_sigaction = countSystemCall;
+    action.sa_flags = SA_SIGINFO;
+    ::sigaction(SIGSYS, &action, nullptr);
+    std::array<sock_filter, 5> filter{{
+        BPF_STMT(BPF_LD | BPF_W | BPF_ABS, offsetof(seccomp_data, nr)),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_rt_sigreturn, 1, 0),
+        BPF_JUMP(BPF_JMP | BPF_JEQ | BPF_K, SYS_exit, 0, 1),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_ALLOW),
+        BPF_STMT(BPF_RET | BPF_K, SECCOMP_RET_TRAP),
+    }};
+    const sock_fprog program{filter.size(), filter.data()};
+    ::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0);
+    ::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program);
+}
+
+// How many a burst makes on its thread.
+template <typename Send> double systemCallsOf(Send send)
+{
+    systemCalls = 0;
+    std::thread([&send] {
+        trapSystemCalls();
+        ::syscall(SYS_getppid); // so that counting is seen to work
+        for (std::size_t each = 0; each < burst; ++each)
+            send();
+        ::syscall(SYS_exit, 0); // not by returning: that needs other system calls
+    }).join();
+    if (systemCalls == 0)
+        throw std::runtime_error("system calls cannot be counted on this machine");
+    return systemCalls - 1;
+}
+
+// --- Time
+
+struct Times {
+    std::vector<double> medians;
+    std::vector<double> slowest; // of a thousand
+};
+
+// Nanoseconds of single calls of `send`, between which everything is prepared by `prepare` and `settle`.
+template <typename Prepare, typename Send, typename Settle>
+void time(Times& times, Prepare prepare, Send send, Settle settle)
+{
+    constexpr double allButOneOfAThousand = 0.999;
+    std::vector<double> each;
+    for (std::size_t round = 0; round < bursts; ++round) {
+        for (std::size_t message = 0; message < burst; ++message) {
+            prepare();
+            const auto start = Clock::now();
+            send();
+            each.push_back(nanosecondsSince(start));
+        }
+        settle();
+    }
+    times.medians.push_back(median(each));
+    times.slowest.push_back(quantile(std::move(each), allButOneOfAThousand));
+}
+
+// Reads and drops.
+ChildProcess runSink(const SocketPair& sockets)
+{
+    return ChildProcess::run([&] {
+        std::array<char, 65536> bytes{};
+        while (::recv(sockets.server.get(), bytes.data(), bytes.size(), 0) > 0) { }
+    });
+}
+
+} // namespace
+
+void measureClientLibrary(const Options& options, Report& report)
+{
+    const ServiceProcess service(options);
+    Reporter reporter(service);
+    const std::string what = "libkesto's send, caller's side";
+
+    SocketPair sockets;
+    const ChildProcess sink = runSink(sockets);
+    const std::string bytes = sampleFrame();
+    const auto sendToSocket = [&] { writeAll(sockets.client.get(), bytes); };
+
+    Times ours;
+    Times built;
+    Times theirs;
+    std::vector<double> calls;
+    std::vector<double> theirCalls;
+    for (int round = 0; round < options.rounds; ++round) {
+        showProgress(fmt::format("{}: round {} of {}", what, round + 1, options.rounds));
+        time(ours, [&] { reporter.build(); }, [&] { reporter.send(); }, [&] { reporter.settle(); });
+        time(
+            built, [] {},
+            [&] {
+                reporter.build();
+                reporter.send();
+            },
+            [&] { reporter.settle(); });
+        time(theirs, [] { }, sendToSocket, [] { });
+        calls.push_back(systemCallsOf([&] {
+            reporter.build();
+            reporter.send();
+        }));
+        reporter.settle();
+        theirCalls.push_back(burst);
+    }
+    clearProgress();
+    const std::string socket = "send(2) of as many bytes";
+    report.add({what + ", median", "ns", ours.medians, Peer{socket, theirs.medians}, Target::figureAtMost(1000)});
+    report.add({what + ", p99.9", "ns", ours.slowest, Peer{socket, theirs.slowest}, Target::figureAtMost(1000)});
+    report.add({fmt::format("{}, system calls of {}", what, burst), "", calls, Peer{socket, theirCalls},
+                Target::figureAtMost(0)});
+    report.add({"building the message and sending it, median", "ns", built.medians});
+}
+
+} // namespace bench

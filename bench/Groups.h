@@ -1,0 +1,20 @@
+// The groups of measurements, each in a file of its own, in the order of the table.
+#pragma once
+
+#include "Harness.h"
+#include "Report.h"
+
+namespace bench {
+
+void measureRoundTrip(const Options& options, Report& report);
+void measurePipeline(const Options& options, Report& report);
+void measureStored(const Options& options, Report& report);
+void measureSession(const Options& options, Report& report);
+void measureLookup(const Options& options, Report& report);
+void measureIdle(const Options& options, Report& report);
+void measureStart(const Options& options, Report& report);
+void measureLogStatement(const Options& options, Report& report);
+void measureClientLibrary(const Options& options, Report& report);
+void measureDecoding(const Options& options, Report& report);
+
+} // namespace bench

@@ -1,0 +1,117 @@
+// The platform of what is measured inside this process: nothing on it costs time, so that the service's own work is
+// what remains. Whatever is submitted to a queue is done at once; nobody wants any event; nothing is logged that is
+// not logged by default, and that goes nowhere.
+#pragma once
+
+#include "platform/Absent.h"
+#include "platform/Platform.h"
+
+namespace bench {
+
+class InProcessPlatform {
+public:
+    InProcessPlatform()
+    {
+        platform::install({.log = log_,
+                           .clock = clock_,
+                           .workQueues = workQueues_,
+                           .preferences = preferences_,
+                           .featureFlags = featureFlags_,
+                           .deviceProperties = deviceProperties_,
+                           .processTable = processTable_,
+                           .notifications = notifications_,
+                           .analytics = analytics_,
+                           .traceMarkers = traceMarkers_,
+                           .reportingChannels = reportingChannels_,
+                           .bugCapture = bugCapture_,
+                           .kernelTrace = kernelTrace_,
+                           .performanceWriter = performanceWriter_,
+                           .fileSystem = fileSystem_});
+    }
+    ~InProcessPlatform() { platform::uninstall(); }
+    InProcessPlatform(const InProcessPlatform&) = delete;
+    InProcessPlatform& operator=(const InProcessPlatform&) = delete;
+
+private:
+    class Log final : public platform::Log {
+        [[nodiscard]] platform::LogLevel threshold(const platform::LogCategory&) const override
+        {
+            return platform::LogLevel::Default;
+        }
+        void write(const platform::LogRecord&) override { }
+    };
+    class Clock final : public platform::Clock {
+        [[nodiscard]] double secondsSince1970() const override { return 1'767'225'600; }
+        [[nodiscard]] double systemUptime() const override { return 86'400; }
+    };
+    class ImmediateQueue final : public platform::WorkQueue {
+        void submit(platform::WorkItem item) override { item(); }
+        [[nodiscard]] bool isCurrent() const override { return true; }
+    };
+    class WorkQueues final : public platform::WorkQueues {
+        [[nodiscard]] std::shared_ptr<platform::WorkQueue> makeSerialQueue(std::string_view,
+                                                                           platform::QualityOfService) override
+        {
+            return std::make_shared<ImmediateQueue>();
+        }
+        [[nodiscard]] platform::WorkQueue& backgroundQueue() override { return background_; }
+        void submitAfter(std::chrono::nanoseconds, platform::WorkQueue&, platform::WorkItem) override { }
+        [[nodiscard]] std::unique_ptr<platform::Semaphore> makeSemaphore(unsigned) override { return nullptr; }
+        ImmediateQueue background_;
+    };
+    class Preferences final : public platform::Preferences {
+        [[nodiscard]] std::optional<foundation::Value> value(std::string_view, std::string_view) const override
+        {
+            return std::nullopt;
+        }
+    };
+    class FeatureFlags final : public platform::FeatureFlags {
+        [[nodiscard]] bool isEnabled(std::string_view, std::string_view) const override { return false; }
+    };
+    class DeviceProperties final : public platform::DeviceProperties {
+        [[nodiscard]] std::optional<bool> boolean(std::string_view) const override { return std::nullopt; }
+    };
+    class ProcessTable final : public platform::ProcessTable {
+        [[nodiscard]] std::int32_t ownProcessIdentifier() const override { return 1; }
+        [[nodiscard]] std::string ownProcessName() const override { return "kestod"; }
+        [[nodiscard]] std::optional<platform::ProcessTableEntry> entry(std::int32_t identifier) const override
+        {
+            return platform::ProcessTableEntry{identifier, "player"};
+        }
+    };
+    class Analytics final : public platform::Analytics {
+        [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
+        void sendAnalyticsEventLazy(std::string, PayloadBuilder) override { }
+    };
+    class FileSystem final : public platform::FileSystem {
+        [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return {}; }
+        [[nodiscard]] std::expected<void, std::error_code> createDirectories(const std::filesystem::path&,
+                                                                             unsigned) override
+        {
+            return std::unexpected(std::make_error_code(std::errc::permission_denied));
+        }
+        [[nodiscard]] std::expected<std::unique_ptr<platform::AtomicFile>, std::error_code>
+        createAtomically(const std::filesystem::path&) override
+        {
+            return std::unexpected(std::make_error_code(std::errc::permission_denied));
+        }
+    };
+
+    Log log_;
+    Clock clock_;
+    WorkQueues workQueues_;
+    Preferences preferences_;
+    FeatureFlags featureFlags_;
+    DeviceProperties deviceProperties_;
+    ProcessTable processTable_;
+    platform::AbsentNotifications notifications_;
+    Analytics analytics_;
+    platform::AbsentTraceMarkers traceMarkers_;
+    platform::AbsentReportingChannels reportingChannels_;
+    platform::AbsentBugCapture bugCapture_;
+    platform::AbsentKernelTrace kernelTrace_;
+    platform::AbsentPerformanceWriter performanceWriter_;
+    FileSystem fileSystem_;
+};
+
+} // namespace bench

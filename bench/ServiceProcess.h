@@ -1,0 +1,40 @@
+// The real service, in directories of its own, and what its clients send.
+#pragma once
+
+#include "ChildProcess.h"
+#include "Harness.h"
+#include "RawClient.h"
+#include "foundation/Value.h"
+
+#include <string>
+#include <string_view>
+
+namespace bench {
+
+class ServiceProcess {
+public:
+    // `used` is the TOML array of the event names in use. Returns before the service listens.
+    explicit ServiceProcess(const Options& options, std::string_view used = "[]");
+
+    [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
+    [[nodiscard]] std::filesystem::path socketPath() const;
+    // Waits until the service listens.
+    [[nodiscard]] platform::FileDescriptor connect() const;
+    // A connection with the sample session on it, started.
+    [[nodiscard]] platform::FileDescriptor connectWithSession() const;
+    // A client that sends the sample message to it.
+    [[nodiscard]] RawClient makeClient() const;
+
+private:
+    TemporaryDirectory directory_;
+    ChildProcess process_;
+};
+
+// A frame with its head.
+[[nodiscard]] std::string frame(const foundation::Array& call);
+// The frame of the sample message, for pre-encoded use. The call's number is the running number, too.
+[[nodiscard]] std::string sampleFrame();
+// The size of its answer's frame.
+constexpr std::size_t sampleAnswerSize = 11;
+
+} // namespace bench

@@ -1,0 +1,115 @@
+// kesto_bench: measures the service and its library, each figure beside that of a peer in the same run, and prints
+// a table. It is a measurement and no test: a target that is missed is said, and the exit status is still 0.
+#include "Groups.h"
+
+#include "foundation/Json.h"
+
+#include <array>
+#include <cstdlib>
+#include <fmt/format.h>
+#include <fstream>
+#include <getopt.h>
+#include <optional>
+
+namespace bench {
+namespace {
+
+struct Group {
+    std::string_view name;
+    std::string_view what;
+    void (*measure)(const Options&, Report&);
+};
+
+constexpr std::array groups{
+    Group{"roundtrip", "waiting for the answer to a message", measureRoundTrip},
+    Group{"pipeline", "messages a second, none stored", measurePipeline},
+    Group{"stored", "messages a second that become stored events", measureStored},
+    Group{"session", "recording a million messages: time and memory", measureSession},
+    Group{"lookup", "finding a session among 10,000 clients", measureLookup},
+    Group{"idle", "wake-ups and memory with nothing to do", measureIdle},
+    Group{"start", "from starting the process to its first answer", measureStart},
+    Group{"log", "a log statement below the threshold", measureLogStatement},
+    Group{"library", "sending with libkesto, as its caller sees it", measureClientLibrary},
+    Group{"decoding", "CBOR, and keeping a payload", measureDecoding},
+};
+
+void printHelp()
+{
+    fmt::print("Usage: kesto_bench [--filter TEXT] [--rounds N] [--json FILE] [--service PROGRAM]\n\n"
+               "Measures Kesto reporting beside its peers and prints a table: the figure, the peer's figure from the\n"
+               "same run, their ratio, the target. Every figure is the median of the rounds.\n\n"
+               "  --filter TEXT      only the groups whose name contains it\n"
+               "  --rounds N         rounds of each measurement, {} at least; {} by default\n"
+               "  --json FILE        write all figures, round by round, to the file, too\n"
+               "  --service PROGRAM  the service to measure; {} by default\n"
+               "  --help             this text\n\nGroups:\n",
+               Options::fewestRounds, Options().rounds, KESTO_BENCH_SERVICE);
+    for (const Group& group : groups)
+        fmt::print("  {:<10} {}\n", group.name, group.what);
+}
+
+// Nothing when the program is done already, or cannot go on: then with that exit status.
+std::optional<Options> parse(int argumentCount, char** arguments, int& status)
+{
+    constexpr std::array<option, 6> known{{{"filter", required_argument, nullptr, 'f'},
+                                           {"rounds", required_argument, nullptr, 'r'},
+                                           {"json", required_argument, nullptr, 'j'},
+                                           {"service", required_argument, nullptr, 's'},
+                                           {"help", no_argument, nullptr, 'h'},
+                                           {}}};
+    constexpr int wrongUsage = 2;
+    Options options;
+    options.service = KESTO_BENCH_SERVICE;
+    for (int given = 0; (given = ::getopt_long(argumentCount, arguments, "", known.data(), nullptr)) != -1;) {
+        switch (given) {
+        case 'f': options.filter = optarg; break;
+        case 'r': options.rounds = std::max(std::atoi(optarg), Options::fewestRounds); break;
+        case 'j': options.json = optarg; break;
+        case 's': options.service = std::filesystem::absolute(optarg); break;
+        case 'h': printHelp(); return std::nullopt;
+        default: status = wrongUsage; return std::nullopt;
+        }
+    }
+    return options;
+}
+
+bool writeJson(const Report& report, const std::filesystem::path& path)
+{
+    std::string text;
+    std::ofstream file(path);
+    if (foundation::appendJson(report.json(), text) && file << text << '\n' << std::flush)
+        return true;
+    fmt::print(stderr, "kesto_bench: {} cannot be written\n", path.native());
+    return false;
+}
+
+int run(const Options& options)
+{
+    Report report;
+    bool isComplete = true;
+    for (const Group& group : groups) {
+        if (group.name.find(options.filter) == std::string_view::npos)
+            continue;
+        try {
+            group.measure(options, report);
+        } catch (const std::exception& problem) {
+            clearProgress();
+            fmt::print(stderr, "kesto_bench: {}: {}\n", group.name, problem.what());
+            isComplete = false;
+        }
+    }
+    fmt::print("{}", report.table());
+    if (!options.json.empty())
+        isComplete &= writeJson(report, options.json);
+    return isComplete ? EXIT_SUCCESS : EXIT_FAILURE;
+}
+
+} // namespace
+} // namespace bench
+
+int main(int argumentCount, char** arguments)
+{
+    int status = EXIT_SUCCESS;
+    const auto options = bench::parse(argumentCount, arguments, status);
+    return options ? bench::run(*options) : status;
+}
