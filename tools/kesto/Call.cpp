@@ -4,6 +4,7 @@
 
 #include "Names.h"
 
+#include <algorithm>
 #include <array>
 #include <fmt/format.h>
 #include <rapidjson/document.h>
