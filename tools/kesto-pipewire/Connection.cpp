@@ -158,7 +158,7 @@ const pw_core_events Connection::coreEvents{
     .done = nullptr,
     .ping = nullptr,
     .error = [](void* data, std::uint32_t id, int, int error,
-                const char* message) { static_cast<Connection*>(data)->failed(id, error, message); },
+                const char*) { static_cast<Connection*>(data)->failed(id, error); },
     .remove_id = nullptr,
     .bound_id = nullptr,
     .add_mem = nullptr,
@@ -176,18 +176,17 @@ const pw_registry_events Connection::registryEvents{
 };
 
 std::unique_ptr<Connection> Connection::open(pw_context& context, const std::string& remote, Graph& graph,
-                                             const Diagnostics& diagnostics, std::function<void()> lost)
+                                             std::function<void()> lost)
 {
     auto* properties = pw_properties_new(PW_KEY_APP_NAME, "kesto-pipewire", nullptr);
     if (!remote.empty())
         pw_properties_set(properties, PW_KEY_REMOTE_NAME, remote.c_str());
     auto* core = pw_context_connect(&context, properties, 0);
-    return core ? std::unique_ptr<Connection>(new Connection(core, graph, diagnostics, std::move(lost))) : nullptr;
+    return core ? std::unique_ptr<Connection>(new Connection(core, graph, std::move(lost))) : nullptr;
 }
 
-Connection::Connection(pw_core* core, Graph& graph, const Diagnostics& diagnostics, std::function<void()> lost)
+Connection::Connection(pw_core* core, Graph& graph, std::function<void()> lost)
     : graph_(graph),
-      diagnostics_(diagnostics),
       lost_(std::move(lost)),
       core_(core),
       registry_(pw_core_get_registry(core, PW_VERSION_REGISTRY, 0))
@@ -206,12 +205,10 @@ Connection::~Connection()
     pw_core_disconnect(core_);
 }
 
-void Connection::failed(ObjectID id, int error, const char* message)
+// Errors of single objects say that they went, or had no format yet, when they were asked: no loss.
+void Connection::failed(ObjectID id, int error)
 {
-    // Errors of single objects say that they went while we asked for them, which the registry tells too.
-    if (id != PW_ID_CORE)
-        return diagnostics_.detail("PipeWire refused something about object {}: {}", id, message);
-    if (error == -EPIPE && lost_)
+    if (id == PW_ID_CORE && error == -EPIPE && lost_)
         std::exchange(lost_, nullptr)();
 }
 

@@ -4,7 +4,6 @@
 // while a stream runs, the profiler (for late cycles); links and devices are told by the registry itself.
 #pragma once
 
-#include "kesto-pipewire/Diagnostics.h"
 #include "kesto-pipewire/Graph.h"
 
 #include <pipewire/core.h>
@@ -26,7 +25,7 @@ public:
     // `lost` is called, once, when the server has gone; the connection is then to be destroyed, but not from
     // within that call. Answers nothing when there is no such server.
     [[nodiscard]] static std::unique_ptr<Connection> open(pw_context& context, const std::string& remote, Graph& graph,
-                                                          const Diagnostics& diagnostics, std::function<void()> lost);
+                                                          std::function<void()> lost);
     ~Connection();
     Connection(const Connection&) = delete;
     Connection& operator=(const Connection&) = delete;
@@ -37,18 +36,17 @@ public:
     void followProfiler();
 
 private:
-    Connection(pw_core* core, Graph& graph, const Diagnostics& diagnostics, std::function<void()> lost);
+    Connection(pw_core* core, Graph& graph, std::function<void()> lost);
 
     void objectAppeared(ObjectID id, std::string_view type, const spa_dict& properties);
     void objectRemoved(ObjectID id);
     void nodeAppeared(ObjectID id, const spa_dict& properties);
-    void failed(ObjectID id, int error, const char* message);
+    void failed(ObjectID id, int error);
 
     static const pw_core_events coreEvents;
     static const pw_registry_events registryEvents;
 
     Graph& graph_;
-    const Diagnostics& diagnostics_;
     std::function<void()> lost_;
     pw_core* core_;
     spa_hook coreHook_{};

@@ -85,7 +85,7 @@ void Observer::connect()
 {
     if (connection_)
         return;
-    connection_ = Connection::open(*context_, remote_, graph_, diagnostics_, [this] {
+    connection_ = Connection::open(*context_, remote_, graph_, [this] {
         lostAt_ = currentMoment();
         loop_.wake(loss_);
     });

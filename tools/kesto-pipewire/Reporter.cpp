@@ -135,6 +135,8 @@ void Reporter::cycleWasLate(StreamSerial serial, Moment when)
 void Reporter::gone(StreamSerial serial, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
+        if (stream.devices.current.empty())
+            stream.devices.current = stream.devices.told; // its links went with it
         tellChanges(stream, infinity);
         stream.running.observe(false, when);
         tellChanges(stream, infinity);
@@ -226,24 +228,24 @@ void Reporter::tellChanges(Stream& stream, double dueUntil)
 void Reporter::tellRunning(Stream& stream, Moment when)
 {
     tellEpisode(stream);
-    stream.running.tell();
+    stream.running.tell(when);
     if (stream.running.told && ++stream.runs == 1) {
-        stream.volume.tell();
-        stream.format.tell();
-        stream.devices.tell();
+        stream.volume.tell(when);
+        stream.format.tell(when);
+        stream.devices.tell(when);
     }
     sendRunning(stream, when);
 }
 
 void Reporter::tellVolume(Stream& stream, Moment when)
 {
-    stream.volume.tell();
+    stream.volume.tell(when);
     send(stream, Category::Volume, EventType::State, {{"PomoSessionVolume", *stream.volume.told}}, when);
 }
 
 void Reporter::tellFormat(Stream& stream, Moment when)
 {
-    stream.format.tell();
+    stream.format.tell(when);
     Payload message;
     append(message, stream.format.told);
     send(stream, Category::Setup, EventType::State, std::move(message), when);
@@ -251,7 +253,7 @@ void Reporter::tellFormat(Stream& stream, Moment when)
 
 void Reporter::tellDevices(Stream& stream, Moment when)
 {
-    stream.devices.tell();
+    stream.devices.tell(when);
     send(stream, Category::RouteChange, EventType::State, {{"active_devices", devicesText(stream.devices.told)}}, when);
 }
 

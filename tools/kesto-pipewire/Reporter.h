@@ -59,7 +59,7 @@ private:
         Value current{};
         Value told{};
         Moment changedAt; // when it became what it is
-        Moment toldSince; // when it became what was told
+        Moment toldSince; // since when it is so, by what was told
         Moment pendingSince; // since when it is not what was told
 
         void observe(Value value, Moment when)
@@ -72,10 +72,10 @@ private:
             changedAt = when;
         }
         [[nodiscard]] bool isPending() const { return current != told; }
-        void tell()
+        void tell(Moment since)
         {
             told = current;
-            toldSince = changedAt;
+            toldSince = since;
         }
     };
 

@@ -37,11 +37,11 @@ struct Options {
 // Brings PipeWire's library up and down again around everything that uses it.
 class Library {
 public:
-    explicit Library(const Options& options)
+    Library()
     {
         pw_init(nullptr, nullptr);
         // What it would say by itself we say in our own words, unless somebody asks for it.
-        if (!options.verbose && !std::getenv("PIPEWIRE_DEBUG"))
+        if (!std::getenv("PIPEWIRE_DEBUG"))
             pw_log_set_level(SPA_LOG_LEVEL_NONE);
     }
     ~Library() { pw_deinit(); }
@@ -59,7 +59,7 @@ ReporterID firstReporterID()
 int run(const Options& options)
 {
     const Diagnostics diagnostics(options.verbose);
-    const Library library(options);
+    const Library library;
     Loop loop;
     const auto end = [&loop] { loop.quit(); };
     const auto terminate = loop.addSignal(SIGTERM, end);

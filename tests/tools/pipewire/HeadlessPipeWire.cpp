@@ -3,11 +3,13 @@
 #include <gtest/gtest.h>
 
 #include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
 #include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstdlib>
@@ -19,6 +21,7 @@ namespace kesto_pipewire {
 
 namespace {
 
+constexpr int longestSilence = 20'000; // milliseconds
 constexpr int exitSkip = 77; // of headless-pipewire, when programs are not installed
 
 struct Pipe {
@@ -100,8 +103,12 @@ void Program::write(const std::string& text) const
 std::string Program::readLine() const
 {
     std::string line;
-    for (char character = 0; ::read(output_, &character, 1) == 1 && character != '\n';)
+    pollfd readable{output_, POLLIN, 0};
+    for (char character = 0; ::poll(&readable, 1, longestSilence) == 1 && ::read(output_, &character, 1) == 1;) {
+        if (character == '\n')
+            break;
         line += character;
+    }
     return line;
 }
 
@@ -135,10 +142,7 @@ HeadlessPipeWire::HeadlessPipeWire()
 
 HeadlessPipeWire::~HeadlessPipeWire()
 {
-    if (instance_) {
-        instance_->closeInput();
-        instance_->wait();
-    }
+    clearAway();
     std::error_code ignored;
     std::filesystem::remove_all(directory_, ignored);
 }
@@ -162,9 +166,15 @@ void HeadlessPipeWire::start()
         throw std::runtime_error("no private PipeWire, status " + std::to_string(status));
 }
 
-void HeadlessPipeWire::kill()
+void HeadlessPipeWire::kill() const
 {
     ::kill(server_, SIGKILL);
+}
+
+void HeadlessPipeWire::clearAway()
+{
+    if (!instance_)
+        return;
     instance_->closeInput();
     instance_->wait();
     instance_.reset();

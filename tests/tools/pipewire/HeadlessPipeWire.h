@@ -24,7 +24,7 @@ public:
     Program& operator=(const Program&) = delete;
 
     void write(const std::string& text) const;
-    // The next line of its output, or an empty one when the output has ended.
+    // The next line of its output, or an empty one when the output has ended or nothing comes for too long.
     [[nodiscard]] std::string readLine() const;
     void kill(int signal) const;
     void closeInput();
@@ -38,7 +38,7 @@ private:
     int output_ = -1;
 };
 
-// Runs one private instance at a time; `restart` gives another one at the same place.
+// Runs one private instance at a time, always at the same place.
 class HeadlessPipeWire {
 public:
     HeadlessPipeWire();
@@ -49,8 +49,9 @@ public:
     // Why there is none although none is broken: programs that are not installed. Else empty.
     [[nodiscard]] const std::string& reasonToSkip() const noexcept { return reasonToSkip_; }
 
-    void start();
-    void kill(); // PipeWire itself, without warning, and then what belongs to it
+    void start(); // after a former instance has been cleared away
+    void kill() const; // PipeWire itself, without warning
+    void clearAway(); // what is left
     [[nodiscard]] std::string socket() const;
     [[nodiscard]] Program::Environment environment() const;
 

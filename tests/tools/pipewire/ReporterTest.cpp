@@ -141,6 +141,17 @@ TEST_F(ReporterTest, AStreamThatGoesWhileItRunsStopsFirst)
     EXPECT_THAT(news(), ElementsAre("Playback Stop 3", "Playback Deactivate 3", "stop", "destroy"));
 }
 
+TEST_F(ReporterTest, ThatAStreamsLinksGoWithItIsNoChangeOfRoute)
+{
+    appearAndRun(stream, 1);
+    news();
+    halt(stream, 3);
+    reporter.devicesChanged(stream, "", at(3.001));
+    reporter.gone(stream, at(3.002));
+
+    EXPECT_THAT(news(), ElementsAre("Playback Stop 3", "Playback Deactivate 3.002", "stop", "destroy"));
+}
+
 TEST_F(ReporterTest, NothingIsToldOfAStreamThatIsGone)
 {
     appearAndRun(stream, 1);

@@ -1,0 +1,352 @@
+// The whole road: a sound that is really played on a real PipeWire, the program as it is shipped, a real service,
+// and the events that it stored.
+
+#include "tools/pipewire/HeadlessPipeWire.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <sqlite3.h>
+
+#include <chrono>
+#include <csignal>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <memory>
+#include <thread>
+
+namespace kesto_pipewire {
+
+namespace {
+
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+using namespace std::chrono_literals;
+
+constexpr auto patience = 20s; // what is waited for comes within a fraction of a second
+
+class EndToEndTest : public testing::Test {
+protected:
+    EndToEndTest()
+    {
+        auto name = (std::filesystem::temp_directory_path() / "kesto-end-to-end-XXXXXX").string();
+        directory = ::mkdtemp(name.data());
+        for (const auto* folder : {"run", "state", "logs", "config"})
+            std::filesystem::create_directory(directory / folder);
+        std::ofstream(directory / "config/device.toml") << "InternalBuild = true\n";
+    }
+    ~EndToEndTest() override
+    {
+        reporter.reset();
+        service.reset();
+        std::filesystem::remove_all(directory);
+    }
+    void SetUp() override
+    {
+        if (!server.reasonToSkip().empty())
+            GTEST_SKIP() << server.reasonToSkip();
+        startService();
+        startReporter();
+    }
+
+    void startService()
+    {
+        service = std::make_unique<Program>(std::vector<std::string>{KESTOD},
+                                            Program::Environment{{"RUNTIME_DIRECTORY", directory / "run"},
+                                                                 {"STATE_DIRECTORY", directory / "state"},
+                                                                 {"LOGS_DIRECTORY", directory / "logs"},
+                                                                 {"CONFIGURATION_DIRECTORY", directory / "config"},
+                                                                 {"KESTO_SERVICE_NAME", "service"},
+                                                                 {"KESTO_LOG", "error"}});
+    }
+    void startReporter()
+    {
+        reporter = std::make_unique<Program>(
+            std::vector<std::string>{"sh", "-c", "exec \"$0\" \"$@\" 2>&1", KESTO_PIPEWIRE, "--socket",
+                                     directory / "run/service", "--remote", server.socket()},
+            Program::Environment{});
+    }
+    // Reads what the reporter says until it says that.
+    [[nodiscard]] bool reporterSays(const std::string& what) const
+    {
+        auto line = reporter->readLine();
+        while (!line.empty() && line != "kesto-pipewire: " + what)
+            line = reporter->readLine();
+        return !line.empty();
+    }
+    void killService()
+    {
+        service->kill(SIGKILL);
+        service.reset();
+    }
+
+    // The first column of every row that the query yields, oldest first. Nothing when there is no store yet.
+    [[nodiscard]] std::vector<std::string> select(const std::string& columns, const std::string& condition) const
+    {
+        sqlite3* database = nullptr;
+        std::vector<std::string> rows;
+        const auto query = "SELECT " + columns + " FROM events WHERE " + condition + " ORDER BY id";
+        if (sqlite3_open_v2((directory / "state/analytics.sqlite3").c_str(), &database, SQLITE_OPEN_READONLY, nullptr)
+            == SQLITE_OK) {
+            sqlite3_stmt* statement = nullptr;
+            sqlite3_prepare_v2(database, query.c_str(), -1, &statement, nullptr);
+            while (statement && sqlite3_step(statement) == SQLITE_ROW) {
+                const auto* text = sqlite3_column_text(statement, 0);
+                rows.emplace_back(text ? reinterpret_cast<const char*>(text) : "null");
+            }
+            sqlite3_finalize(statement);
+        }
+        sqlite3_close(database);
+        return rows;
+    }
+    // The values of a key in every event of that name.
+    [[nodiscard]] std::vector<std::string> values(const std::string& event, const std::string& key) const
+    {
+        return select("json_extract(payload, '$." + key + "')", "name = 'com.quarn." + event + "'");
+    }
+    // The names of all events, without what all of them begin with, and without the service's own of its clients.
+    [[nodiscard]] std::vector<std::string> events() const
+    {
+        return select("substr(name, 17)", "name LIKE 'com.quarn.kesto.%' AND name NOT LIKE '%uptime'");
+    }
+    // Waits until there are so many events of that name.
+    [[nodiscard]] bool comes(const std::string& event, std::size_t count = 1) const
+    {
+        const auto end = std::chrono::steady_clock::now() + patience;
+        while (values(event, "audiotag").size() < count) {
+            if (std::chrono::steady_clock::now() > end)
+                return false;
+            std::this_thread::sleep_for(5ms);
+        }
+        return true;
+    }
+    // Sound takes its time, and how much of it is what the test is about.
+    static void letItPlay(std::chrono::milliseconds duration) { std::this_thread::sleep_for(duration); }
+
+    HeadlessPipeWire server;
+    std::filesystem::path directory;
+    std::unique_ptr<Program> service;
+    std::unique_ptr<Program> reporter;
+};
+
+TEST_F(EndToEndTest, AToneThatIsPausedAndMadeSofterBecomesTheseEvents)
+{
+    {
+        const auto player = server.playTone("Music");
+        ASSERT_TRUE(comes("kesto.Playback.Start"));
+        server.runToEnd({"pactl", "set-sink-input-volume", server.onlySinkInput(), "50%"});
+        ASSERT_TRUE(comes("kesto.Volume.State"));
+        player->write("pause\n");
+        ASSERT_TRUE(comes("kesto.Playback.Stop"));
+        player->write("play\n");
+        ASSERT_TRUE(comes("kesto.Playback.Start", 2));
+    }
+    ASSERT_TRUE(comes("kesto.Playback.Deactivate"));
+
+    EXPECT_THAT(events(),
+                ElementsAre("Playback.Start", "Volume.State", "Playback.Stop", "Playback.Start", "Playback.Stop",
+                            "Playback.Deactivate"));
+    EXPECT_THAT(values("longformaudio.Playback.Start", "session_output_running"), ElementsAre("1", "1"));
+    EXPECT_THAT(values("longformaudio.Playback.Start", "PomoSessionVolume"), ElementsAre("1", "0.5"));
+    EXPECT_THAT(values("kesto.Playback.Start", "session_selected_format"),
+                ElementsAre("S16LE/44100/2", "S16LE/44100/2"));
+    EXPECT_THAT(values("kesto.Playback.Start", "mChannelsPerFrame"), ElementsAre("2", "2"));
+    EXPECT_THAT(values("kesto.Playback.Start", "active_devices"), ElementsAre("null-sink", "null-sink"));
+    EXPECT_THAT(values("kesto.Playback.Start", "HostApplicationDisplayID"), ElementsAre("tone-player", "tone-player"));
+    EXPECT_THAT(values("kesto.Volume.State", "PomoSessionVolume"), ElementsAre("0.5"));
+    EXPECT_THAT(values("kesto.Playback.Stop", "session_output_running"), ElementsAre("0", "0"));
+}
+
+TEST_F(EndToEndTest, ARecordingBecomesTheseEvents)
+{
+    {
+        const auto recorder = server.record();
+        ASSERT_TRUE(comes("generic.Record.Start"));
+    }
+    ASSERT_TRUE(comes("kesto.Record.Deactivate"));
+
+    EXPECT_THAT(events(), ElementsAre("Record.Start", "Record.Stop", "Record.Deactivate"));
+    EXPECT_THAT(values("kesto.Record.Start", "session_input_running"), ElementsAre("1"));
+}
+
+// When something happened, as far as one can tell from outside: after the command and before its event was stored.
+struct Bracket {
+    std::chrono::steady_clock::time_point earliest;
+    std::chrono::steady_clock::time_point latest;
+};
+
+// Whether the text is a duration that may have passed between the two.
+void expectDuration(const std::string& seconds, const Bracket& begin, const Bracket& end)
+{
+    using Seconds = std::chrono::duration<double>;
+    EXPECT_GE(std::stod(seconds), Seconds(end.earliest - begin.latest).count());
+    EXPECT_LE(std::stod(seconds), Seconds(end.latest - begin.earliest).count());
+}
+
+TEST_F(EndToEndTest, PlayingYieldsVolumeEventsOfTheRightLengths)
+{
+    const auto bracket = [](auto act) {
+        const auto before = std::chrono::steady_clock::now();
+        act();
+        return Bracket{before, std::chrono::steady_clock::now()};
+    };
+    std::unique_ptr<Program> player;
+    const auto start = bracket([&] {
+        player = server.playTone("Music");
+        ASSERT_TRUE(comes("kesto.Playback.Start"));
+    });
+    const auto input = server.onlySinkInput();
+    letItPlay(1000ms);
+    const auto change = bracket([&] {
+        server.runToEnd({"pactl", "set-sink-input-volume", input, "50%"});
+        ASSERT_TRUE(comes("kesto.Volume.State"));
+    });
+    letItPlay(700ms);
+    const auto pause = bracket([&] {
+        player->write("pause\n");
+        ASSERT_TRUE(comes("kesto.Playback.Stop"));
+    });
+    const auto resumption = bracket([&] {
+        player->write("play\n");
+        ASSERT_TRUE(comes("kesto.Playback.Start", 2));
+    });
+    letItPlay(1300ms);
+    const auto end = bracket([&] {
+        player.reset();
+        ASSERT_TRUE(comes("kesto.Playback.Deactivate"));
+    });
+    ASSERT_TRUE(comes("kesto.Volume.Summary", 3));
+
+    EXPECT_THAT(values("kesto.Volume.Summary", "PomoSessionVolume"), ElementsAre("1", "0.5", "0.5"));
+    EXPECT_THAT(values("kesto.Volume.Summary", "active_devices"), testing::Each("null-sink"));
+    EXPECT_THAT(values("kesto.Volume.Summary", "session_selected_format"), testing::Each("S16LE/44100/2"));
+    EXPECT_THAT(values("kesto.Volume.Summary", "HostApplicationDisplayID"), testing::Each("tone-player"));
+    const auto lengths = values("kesto.Volume.Summary", "play_seconds");
+    expectDuration(lengths[0], start, change);
+    expectDuration(lengths[1], change, pause);
+    expectDuration(lengths[2], resumption, end);
+}
+
+TEST_F(EndToEndTest, TwoStreamsAtOnceDoNotMix)
+{
+    {
+        const auto one = server.playOverPulse("music");
+        ASSERT_TRUE(comes("kesto.Playback.Start"));
+        server.runToEnd({"pactl", "set-sink-input-volume", server.onlySinkInput(), "50%"});
+        ASSERT_TRUE(comes("kesto.Volume.State"));
+        const auto other = server.playTone("Game");
+        ASSERT_TRUE(comes("nonlongformaudio.Playback.Start"));
+        letItPlay(700ms);
+    }
+    ASSERT_TRUE(comes("longformaudio.Volume.Summary"));
+    ASSERT_TRUE(comes("nonlongformaudio.Volume.Summary"));
+
+    EXPECT_THAT(values("longformaudio.Volume.Summary", "HostApplicationDisplayID"), ElementsAre("pacat"));
+    EXPECT_THAT(values("longformaudio.Volume.Summary", "PomoSessionVolume"), ElementsAre("0.5"));
+    EXPECT_THAT(values("nonlongformaudio.Volume.Summary", "HostApplicationDisplayID"), ElementsAre("tone-player"));
+    EXPECT_THAT(values("nonlongformaudio.Volume.Summary", "PomoSessionVolume"), ElementsAre("1"));
+}
+
+TEST_F(EndToEndTest, AServiceThatIsKilledIsToldTheStateAgainWhenItIsBack)
+{
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(comes("kesto.Playback.Start"));
+    killService();
+    startService();
+    ASSERT_TRUE(comes("kesto.Playback.Start", 2));
+    server.runToEnd({"pactl", "set-sink-input-volume", server.onlySinkInput(), "50%"});
+    ASSERT_TRUE(comes("kesto.Volume.State"));
+    const auto times = values("kesto.Playback.Start", "kestoreporting_timestamp");
+
+    EXPECT_EQ(times[0], times[1]); // it has played since then
+}
+
+TEST_F(EndToEndTest, WhenPipeWireIsKilledSessionsEndAndItsSuccessorIsReported)
+{
+    {
+        const auto player = server.playTone("Music");
+        ASSERT_TRUE(comes("longformaudio.Playback.Start"));
+        server.kill();
+        ASSERT_TRUE(comes("longformaudio.Playback.Deactivate"));
+    }
+    EXPECT_THAT(events(), ElementsAre("Playback.Start", "Playback.Stop", "Playback.Deactivate"));
+    server.clearAway();
+    server.start();
+    const auto player = server.playTone("Game");
+
+    EXPECT_TRUE(comes("nonlongformaudio.Playback.Start"));
+}
+
+TEST_F(EndToEndTest, ATerminatedReporterEndsItsSessionsFirst)
+{
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(comes("kesto.Playback.Start"));
+    reporter->kill(SIGTERM);
+    EXPECT_EQ(reporter->wait(), 0);
+
+    EXPECT_THAT(events(), ElementsAre("Playback.Start", "Playback.Stop", "Playback.Deactivate"));
+}
+
+TEST_F(EndToEndTest, AReporterFindsTheServiceWhenItComes)
+{
+    ASSERT_TRUE(reporterSays("connected to the reporting service"));
+    killService();
+    ASSERT_TRUE(reporterSays("waiting for the reporting service"));
+    const auto player = server.playTone("Music");
+    startService();
+
+    EXPECT_TRUE(comes("kesto.Playback.Start"));
+}
+
+TEST_F(EndToEndTest, AReporterWithoutAServiceEndsCleanlyToo)
+{
+    ASSERT_TRUE(reporterSays("connected to the reporting service"));
+    killService();
+    ASSERT_TRUE(reporterSays("waiting for the reporting service"));
+    reporter->kill(SIGINT);
+
+    EXPECT_EQ(reporter->wait(), 0);
+}
+
+class CommandLineTest : public testing::Test {
+protected:
+    struct Outcome {
+        std::string firstLine;
+        int status = 0;
+    };
+    static Outcome run(std::vector<std::string> arguments)
+    {
+        arguments.insert(arguments.begin(), KESTO_PIPEWIRE);
+        Program program(arguments, {});
+        auto line = program.readLine();
+        return {std::move(line), program.wait()};
+    }
+};
+
+TEST_F(CommandLineTest, HelpAndVersionAreNoErrors)
+{
+    const auto help = run({"--help"});
+    EXPECT_THAT(help.firstLine, testing::HasSubstr("Reports every stream"));
+    EXPECT_EQ(help.status, 0);
+    const auto version = run({"--version"});
+    EXPECT_THAT(version.firstLine, testing::StartsWith("kesto-pipewire "));
+    EXPECT_EQ(version.status, 0);
+}
+
+TEST_F(CommandLineTest, WrongUseIsToldByTheStatus)
+{
+    EXPECT_EQ(run({"--no-such-option"}).status, 64);
+    EXPECT_EQ(run({"surplus"}).status, 64);
+    EXPECT_EQ(run({"--socket"}).status, 64);
+}
+
+TEST_F(CommandLineTest, ASocketThatCannotBeIsToldByTheStatus)
+{
+    EXPECT_EQ(run({"--socket", "/" + std::string(200, 'x')}).status, 78);
+}
+
+} // namespace
+
+} // namespace kesto_pipewire
