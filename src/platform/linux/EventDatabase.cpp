@@ -14,20 +14,29 @@ namespace {
 // What stays of a log that grew for a while, once it begins anew.
 constexpr std::uint64_t mostLogKept = 16 * 1024 * 1024;
 
-StoreError errorOfSystem(int systemError)
+bool isForWantOfRoom(int systemError)
 {
-    switch (systemError) {
-    case ENOSPC:
-    case EDQUOT:
-    case EFBIG: return StoreError::DiskFull;
-    case EROFS: return StoreError::ReadOnly;
-    default: return StoreError::InputOutput;
-    }
+    return systemError == ENOSPC || systemError == EDQUOT || systemError == EFBIG;
 }
 
-StoreError errorOf(int code, int systemError)
+// SQLite knows a full disk by itself, but neither a quota nor a limit of files that is used up.
+StoreError errorOfDisk(sqlite3* connection)
 {
-    switch (code & 0xFF) {
+    for (const int which : {SQLITE_FCNTL_FILE_POINTER, SQLITE_FCNTL_JOURNAL_POINTER}) {
+        sqlite3_file* file = nullptr;
+        int systemError = 0;
+        ::sqlite3_file_control(connection, "main", which, static_cast<void*>(&file));
+        if (file != nullptr && file->pMethods != nullptr)
+            file->pMethods->xFileControl(file, SQLITE_FCNTL_LAST_ERRNO, &systemError);
+        if (isForWantOfRoom(systemError))
+            return StoreError::DiskFull;
+    }
+    return isForWantOfRoom(::sqlite3_system_errno(connection)) ? StoreError::DiskFull : StoreError::InputOutput;
+}
+
+StoreError errorOf(sqlite3* connection)
+{
+    switch (::sqlite3_errcode(connection) & 0xFF) {
     case SQLITE_FULL: return StoreError::DiskFull;
     case SQLITE_READONLY: return StoreError::ReadOnly;
     case SQLITE_BUSY:
@@ -35,7 +44,7 @@ StoreError errorOf(int code, int systemError)
     case SQLITE_CANTOPEN:
     case SQLITE_PERM:
     case SQLITE_AUTH: return StoreError::CannotOpen;
-    case SQLITE_IOERR: return errorOfSystem(systemError);
+    case SQLITE_IOERR: return errorOfDisk(connection);
     case SQLITE_CORRUPT:
     case SQLITE_NOTADB: return StoreError::Corrupt;
     default: return StoreError::Other;
@@ -171,7 +180,9 @@ EventDatabase::Expected<> EventDatabase::prepareStatements()
         {&commit_, "COMMIT"},
         {&insertOne_, insertOne},
         {&insertMany_, insertMany},
-        {&deleteOldest_, "DELETE FROM events WHERE id < (SELECT min(id) FROM events) + ? AND time < ?"}};
+        {&deleteBefore_, "DELETE FROM events WHERE time < ? AND id < (SELECT min(id) FROM events) + ?"},
+        {&sizesOfOldest_, "SELECT id, length(CAST(payload AS BLOB)) FROM events ORDER BY id LIMIT ?"},
+        {&deleteUpTo_, "DELETE FROM events WHERE id <= ?"}};
     for (const auto& [statement, sql] : wanted) {
         auto prepared = prepare(sql);
         if (!prepared)
@@ -258,13 +269,31 @@ EventDatabase::Expected<EventDatabase::Size> EventDatabase::size()
                 .freeBytes = static_cast<std::uint64_t>(*free) * pageSize_};
 }
 
-EventDatabase::Expected<std::uint64_t> EventDatabase::deleteOldest(std::uint64_t most, double before)
+EventDatabase::Expected<std::uint64_t> EventDatabase::deleteBefore(double time, std::uint64_t most)
 {
-    ::sqlite3_bind_int64(deleteOldest_.get(), 1, static_cast<std::int64_t>(most));
-    ::sqlite3_bind_double(deleteOldest_.get(), 2, before);
-    if (const auto done = run(deleteOldest_); !done)
-        return std::unexpected(done.error());
-    return static_cast<std::uint64_t>(::sqlite3_changes64(connection_.get()));
+    ::sqlite3_bind_double(deleteBefore_.get(), 1, time);
+    ::sqlite3_bind_int64(deleteBefore_.get(), 2, static_cast<std::int64_t>(most));
+    return runAndCountChanges(deleteBefore_);
+}
+
+EventDatabase::Expected<std::uint64_t> EventDatabase::deleteOldest(std::uint64_t bytes, std::uint64_t most)
+{
+    ::sqlite3_bind_int64(sizesOfOldest_.get(), 1, static_cast<std::int64_t>(most));
+    std::int64_t last = 0;
+    std::uint64_t counted = 0;
+    int step = SQLITE_ROW;
+    while (counted < bytes && (step = ::sqlite3_step(sizesOfOldest_.get())) == SQLITE_ROW) {
+        last = ::sqlite3_column_int64(sizesOfOldest_.get(), 0);
+        counted += static_cast<std::uint64_t>(::sqlite3_column_int64(sizesOfOldest_.get(), 1));
+    }
+    if (step != SQLITE_ROW && step != SQLITE_DONE) {
+        const StoreError error = lastError();
+        ::sqlite3_reset(sizesOfOldest_.get());
+        return std::unexpected(error);
+    }
+    ::sqlite3_reset(sizesOfOldest_.get());
+    ::sqlite3_bind_int64(deleteUpTo_.get(), 1, last);
+    return runAndCountChanges(deleteUpTo_);
 }
 
 EventDatabase::Expected<> EventDatabase::shrink(std::uint64_t mostBytes)
@@ -276,7 +305,7 @@ EventDatabase::Expected<> EventDatabase::shrink(std::uint64_t mostBytes)
 
 StoreError EventDatabase::lastError() const
 {
-    return errorOf(::sqlite3_errcode(connection_.get()), ::sqlite3_system_errno(connection_.get()));
+    return errorOf(connection_.get());
 }
 
 EventDatabase::Expected<> EventDatabase::execute(const char* sql)
@@ -318,6 +347,13 @@ EventDatabase::Expected<> EventDatabase::run(const Statement& statement)
     const StoreError error = lastError(); // before the statement is reset
     ::sqlite3_reset(statement.get());
     return std::unexpected(error);
+}
+
+EventDatabase::Expected<std::uint64_t> EventDatabase::runAndCountChanges(const Statement& statement)
+{
+    if (const auto done = run(statement); !done)
+        return std::unexpected(done.error());
+    return static_cast<std::uint64_t>(::sqlite3_changes64(connection_.get()));
 }
 
 } // namespace platform

@@ -38,7 +38,7 @@ public:
     // One statement for many rows: AUTOINCREMENT keeps its books once a statement, which costs as much as a row.
     static constexpr std::size_t rowsAtOnce = 16;
     // For how long a program that locks the database may hold up the store.
-    static constexpr std::chrono::milliseconds longestWaitForLock{5000};
+    static constexpr std::chrono::milliseconds longestWaitForLock{2000};
 
     // Opens the file, or makes it. One that is corrupt or newer is left as it is.
     [[nodiscard]] static Expected<std::unique_ptr<EventDatabase>> open(const std::filesystem::path& path);
@@ -69,8 +69,10 @@ public:
         std::uint64_t freeBytes = 0; // within the file
     };
     [[nodiscard]] Expected<Size> size();
-    // Deletes, of the `most` oldest events, those from before that time.
-    [[nodiscard]] Expected<std::uint64_t> deleteOldest(std::uint64_t most, double before);
+    // Deletes, of the `most` oldest events, those from before that time. Returns how many.
+    [[nodiscard]] Expected<std::uint64_t> deleteBefore(double time, std::uint64_t most);
+    // Deletes the oldest events, as many as take so many bytes, but at most so many. Returns how many.
+    [[nodiscard]] Expected<std::uint64_t> deleteOldest(std::uint64_t bytes, std::uint64_t most);
     // Gives free room of the file back to the file system, at most so much.
     [[nodiscard]] Expected<> shrink(std::uint64_t mostBytes);
 
@@ -97,6 +99,7 @@ private:
     [[nodiscard]] Expected<Statement> prepare(std::string_view sql);
     // Runs the statement to its first row, or to its end; it is then ready for the next time.
     [[nodiscard]] Expected<> run(const Statement& statement);
+    [[nodiscard]] Expected<std::uint64_t> runAndCountChanges(const Statement& statement);
     static void bind(const Statement& statement, int firstParameter, const EventRow& row);
 
     const std::filesystem::path path_;
@@ -110,7 +113,9 @@ private:
     Statement commit_;
     Statement insertMany_;
     Statement insertOne_;
-    Statement deleteOldest_;
+    Statement deleteBefore_;
+    Statement sizesOfOldest_;
+    Statement deleteUpTo_;
 };
 
 } // namespace platform

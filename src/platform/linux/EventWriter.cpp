@@ -5,9 +5,9 @@
 #include <algorithm>
 #include <array>
 #include <fmt/chrono.h>
-#include <limits>
 #include <set>
 #include <system_error>
+#include <utility>
 
 namespace platform {
 namespace {
@@ -15,7 +15,8 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr std::size_t mostPayloadRoomKept = 256 * 1024; // in bytes; what a burst needed beyond that is given back
-constexpr std::uint64_t bytesShrunkAtOnce = 1024 * 1024;
+constexpr std::uint64_t bytesOfARow = 24; // beside its texts, roughly
+constexpr std::uint64_t bytesTidiedAtOnce = 1024 * 1024;
 constexpr double secondsADay = 86400;
 
 fs::path withSuffix(const fs::path& path, std::string_view suffix)
@@ -155,7 +156,6 @@ void EventWriter::keep(std::span<const AnalyticsEvent> events)
         losses_.add(kept.error(), events.size());
     }
     losses_.report();
-    sinceCheck_ += events.size();
     if (payloads_.capacity() > mostPayloadRoomKept)
         payloads_ = std::string();
 }
@@ -176,6 +176,8 @@ EventWriter::Expected<std::uint64_t> EventWriter::write(std::span<const Analytic
             makeRows(events.first(count));
             events = events.subspan(count);
             written += rows_.size();
+            for (const EventRow& row : rows_)
+                bytesSinceCheck_ += bytesOfARow + row.name.size() + row.payload.size();
             if (const auto done = database_->insert(rows_); !done)
                 return done;
         }
@@ -238,11 +240,11 @@ bool EventWriter::maintain()
     const std::uint64_t logBytes = database_->logBytes();
     if (logBytes < logBytesAtCheckpoint_)
         logBytesAtCheckpoint_ = 0; // it began anew
-    if (logBytes - logBytesAtCheckpoint_ >= logBytesBetweenCheckpoints)
+    if (logBytes - logBytesAtCheckpoint_ >= std::min(logBytesBetweenCheckpoints, maximumBytes() / 4))
         emptyLog();
-    const bool isDue = hasMoreToTidy_ || sinceCheck_ >= eventsBetweenChecks
+    const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
         || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
-    hasMoreToTidy_ = isDue && logBytes <= maximumBytes() && tidy(); // tidying makes the log longer
+    hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && tidy(); // tidying makes the log longer
     return hasMoreToTidy_;
 }
 
@@ -250,48 +252,50 @@ bool EventWriter::emptyLog()
 {
     const double now = clock_.systemUptime();
     const bool waits = database_->logBytes() > maximumBytes() / 2 && now >= waitForReadersAt_;
-    if (waits)
-        waitForReadersAt_ = now + secondsBetweenWaits;
     const bool isEmpty = database_->emptyLog(waits ? waitForReaders : std::chrono::milliseconds());
+    if (waits && !isEmpty)
+        waitForReadersAt_ = now + secondsBetweenWaits;
     logBytesAtCheckpoint_ = database_->logBytes();
     return isEmpty;
 }
 
-// Deletes more than came since the last time, so that it keeps up, but not everything at once. True when more is
-// left to do.
+// Makes more room than was taken since the last time, so that it keeps up, but not all of it at once. True when more
+// is left to do.
 bool EventWriter::tidy()
 {
-    const std::uint64_t most = 2 * sinceCheck_ + eventsDeletedAtOnce;
-    sinceCheck_ = 0;
+    const std::uint64_t mostFreed = 2 * std::exchange(bytesSinceCheck_, 0) + bytesTidiedAtOnce;
     checkedAt_ = clock_.systemUptime();
-    for (std::uint64_t done = 0; done < most;) {
-        const auto some = tidySome();
-        if (!some)
-            handleFailure(some.error());
-        if (!some || *some == 0)
+    // Deleting turns used room into free room, and shrinking free room into none.
+    const auto room = [](const EventDatabase::Size& size) { return 2 * size.usedBytes + size.freeBytes; };
+    auto size = database_->size();
+    const std::uint64_t roomBefore = size ? room(*size) : 0;
+    while (size && room(*size) + mostFreed > roomBefore) {
+        const auto hasMore = tidySome(*size);
+        if (hasMore && !*hasMore)
             return false;
-        done += *some;
+        size = hasMore ? database_->size() : std::unexpected(hasMore.error());
     }
-    return true;
+    if (!size)
+        handleFailure(size.error());
+    return size.has_value();
 }
 
-// Returns how much it did, 0 when nothing is left to do.
-EventWriter::Expected<std::uint64_t> EventWriter::tidySome()
+// False when nothing is left to do.
+EventWriter::Expected<bool> EventWriter::tidySome(const EventDatabase::Size& size)
 {
-    const auto size = database_->size();
-    if (!size)
-        return std::unexpected(size.error());
-    const bool isTooLarge = size->usedBytes > maximumBytes();
     const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
-    const auto deleted =
-        database_->deleteOldest(eventsDeletedAtOnce, isTooLarge ? std::numeric_limits<double>::infinity() : tooOld);
+    const auto deleted = size.usedBytes > maximumBytes()
+        ? database_->deleteOldest(size.usedBytes - maximumBytes(), eventsDeletedAtOnce)
+        : database_->deleteBefore(tooOld, eventsDeletedAtOnce);
+    if (!deleted)
+        return std::unexpected(deleted.error());
     // New events fill what old ones left free; the file shrinks only where far too much is free.
-    const bool isFileTooLarge = size->usedBytes + size->freeBytes > maximumBytes() + maximumBytes() / 8;
-    if (deleted != 0 || !isFileTooLarge || size->freeBytes == 0)
-        return deleted;
-    if (const auto done = database_->shrink(bytesShrunkAtOnce); !done)
+    const bool isFileTooLarge = size.usedBytes + size.freeBytes > maximumBytes() + maximumBytes() / 8;
+    if (*deleted > 0 || !isFileTooLarge || size.freeBytes == 0)
+        return *deleted > 0;
+    if (const auto done = database_->shrink(bytesTidiedAtOnce); !done)
         return std::unexpected(done.error());
-    return eventsDeletedAtOnce;
+    return true;
 }
 
 } // namespace platform

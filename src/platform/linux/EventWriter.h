@@ -31,14 +31,16 @@ public:
     static constexpr std::string_view fileName = "analytics.sqlite3";
     static constexpr std::size_t mostDamagedKept = 3; // databases set aside; older ones are removed
     static constexpr double secondsBetweenOpenings = 1; // of a database that could not be opened
-    // Of the write-ahead log: when it is moved to the database. What is moved at once holds up the next commit.
+    // How long the write-ahead log gets before it is moved to the database, unless a quarter of the bound of size
+    // is less. What is moved at once holds up the next commit.
     static constexpr std::uint64_t logBytesBetweenCheckpoints = 8 * 1024 * 1024;
-    // When a log that readers keep from beginning anew is longer than half its limit, the writer waits for them
-    // that long, and not again for a while. The limit is the same as the one of the database.
+    // When the log is longer than half the bound of size, because readers keep it from beginning anew, the writer
+    // waits for them so long; when that was in vain, not again for a while. A log as long as the bound takes no more.
     static constexpr std::chrono::milliseconds waitForReaders{200};
     static constexpr double secondsBetweenWaits = 2;
-    // The bounds of age and size are looked after when so much was kept, or so much time went by.
-    static constexpr std::uint64_t eventsBetweenChecks = 4096;
+    // The bounds of age and size are looked after when so much was kept, or so much time went by. What goes then,
+    // goes in transactions of so many events.
+    static constexpr std::uint64_t bytesBetweenChecks = 1024 * 1024;
     static constexpr double secondsBetweenChecks = 60;
     static constexpr std::uint64_t eventsDeletedAtOnce = 512;
 
@@ -69,7 +71,7 @@ private:
     void handleFailure(StoreError error);
     bool emptyLog();
     [[nodiscard]] bool tidy();
-    [[nodiscard]] Expected<std::uint64_t> tidySome();
+    [[nodiscard]] Expected<bool> tidySome(const EventDatabase::Size& size);
     [[nodiscard]] std::uint64_t maximumBytes() const noexcept;
 
     const std::filesystem::path path_;
@@ -85,7 +87,7 @@ private:
     std::uint64_t logBytesAtCheckpoint_ = 0;
     double waitForReadersAt_ = 0;
     double checkedAt_ = 0; // the bounds of age and size
-    std::uint64_t sinceCheck_ = 0; // events
+    std::uint64_t bytesSinceCheck_ = 0;
     bool hasMoreToTidy_ = true;
 
     std::vector<EventRow> rows_;
