@@ -35,7 +35,7 @@ public:
     MOCK_METHOD(void, killService, (SuccessReply), (override));
 };
 
-const Value null;
+const Value null{};
 constexpr std::int64_t leastID = std::numeric_limits<std::int64_t>::min();
 constexpr std::int64_t largestID = std::numeric_limits<std::int64_t>::max();
 constexpr std::uint64_t largestCall = std::numeric_limits<std::uint64_t>::max();

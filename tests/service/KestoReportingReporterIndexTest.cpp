@@ -3,6 +3,7 @@
 #include "service/KestoReportingReporterIndex.h"
 #include "support/ServiceHarness.h"
 
+#include <array>
 #include <gtest/gtest.h>
 #include <rapidcheck/gtest.h>
 
@@ -47,19 +48,19 @@ RC_GTEST_PROP(ReporterIndex, FindsWhatAWalkOverTheRegistryFinds, ())
     }
 }
 
-// The index never looks into a client: any address stands for one.
 class BareIndexTest : public testing::Test {
 protected:
-    using Client = KestoReportingReporterIndex::Client;
-    [[nodiscard]] const Client& client(std::size_t number) const
+    [[nodiscard]] const KestoReportingClientServerInstance& client(std::size_t number) const
     {
-        return reinterpret_cast<const Client&>(addresses_[number]);
+        return clients_[number];
     }
 
     KestoReportingReporterIndex index;
 
 private:
-    std::array<char, 3> addresses_{};
+    const TestPlatform platform_;
+    const std::weak_ptr<KestoReportingServiceDelegateProtocol> nobody_;
+    const std::array<KestoReportingClientServerInstance, 2> clients_{{{1001, nobody_}, {1002, nobody_}}};
 };
 
 TEST_F(BareIndexTest, DoesNotCountClientsThatAreNotRegistered)

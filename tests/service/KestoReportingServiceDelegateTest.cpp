@@ -3,6 +3,7 @@
 #include "support/ServiceHarness.h"
 
 #include <gmock/gmock.h>
+#include <map>
 
 namespace {
 
@@ -250,6 +251,25 @@ TEST_F(ServiceTest, ListsActiveSessionsByClientAndThenByTheirPlaceInTheMap)
     player.call(StopReportingSessionForID, 1);
     EXPECT_THAT(service.getAllActiveReportingSessions(),
                 ElementsAre(player.session(3), player.session(2), recorder.session(9)));
+}
+
+// --- the log
+
+TEST_F(ServiceTest, NamesTheClassOfEachLogLineInWhicheverFileItStands)
+{
+    auto player = harness.connect();
+    player.call(CreateReportingSession, 42);
+    player.call(StartReportingSessionForID, 42);
+    player.call(SendMessage, Dictionary{{"a", 1}}, 4, 1, Array{42});
+    platform.notifications.post("com.quarn.kesto.reporting");
+    player.call(StopReportingSessionForID, 42);
+    player.breakOff();
+    const std::map<std::string, std::string> classes{{"kerc", "KestoReportingClientServerInstance"},
+                                                     {"kers", "KestoReportingServiceDelegate"},
+                                                     {"kerr", "KestoReportingSession"},
+                                                     {"keri", "KestoReportingSession"}};
+    for (const LogLine& line : platform.log.take())
+        EXPECT_EQ(line.file, classes.at(line.tag)) << line.message;
 }
 
 // --- bug capture

@@ -140,6 +140,29 @@ TEST(MessageStore, BeginsEmpty)
     EXPECT_EQ(store.counts(), Dictionary());
 }
 
+TEST(MessageStore, LetsACopyOfACursorGoOnByItself)
+{
+    KestoReportingMessageStore store(plenty());
+    for (int message = 0; message < 3000; ++message) // more than one chunk
+        store.record(4, 1, {{"a", message}});
+    const auto value = [](const KestoReportingMessageStore::Cursor& cursor) {
+        return cursor.payload().dictionary().find("a")->number()->exactly<int>();
+    };
+    KestoReportingMessageStore::Cursor cursor(store);
+    for (int message = 0; message < 2000; ++message)
+        ASSERT_TRUE(cursor.next());
+    auto copy = cursor;
+    EXPECT_EQ(value(cursor), 1999);
+    for (int message = 2000; message < 3000; ++message) {
+        ASSERT_TRUE(copy.next());
+        ASSERT_EQ(value(copy), message);
+    }
+    EXPECT_FALSE(copy.next());
+    EXPECT_EQ(value(cursor), 1999);
+    EXPECT_TRUE(cursor.next());
+    EXPECT_EQ(value(cursor), 2000);
+}
+
 TEST(MessageStore, TellsNumbersApartThatDoublesCannot)
 {
     KestoReportingMessageStore store(plenty());

@@ -36,7 +36,7 @@ enum Method : std::uint8_t {
 
 // What came back for one call, in order: each [error, values...].
 using Answers = std::vector<foundation::Array>;
-inline const foundation::Value null;
+inline const foundation::Value null{};
 inline const foundation::Array succeeded{null, true};
 inline const foundation::Array delivered{null};
 inline Answers answeredOnce(foundation::Array answer)
