@@ -101,6 +101,8 @@ void Reporter::runningChanged(StreamSerial serial, bool running, Moment when)
     update(serial, when, [&](Stream& stream) {
         if (!running && stream.running.current && !stream.running.told)
             tellChanges(stream, infinity); // it did run, however short
+        if (running && !stream.running.current)
+            stream.setOffAt = when;
         stream.running.observe(running, when);
     });
 }
@@ -123,7 +125,7 @@ void Reporter::devicesChanged(StreamSerial serial, const std::string& devices, M
 void Reporter::cycleWasLate(StreamSerial serial, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
-        if (!stream.running.told || when.uptime < stream.running.toldSince.uptime + startUpTime)
+        if (!stream.running.told || when.uptime < stream.setOffAt.uptime + startUpTime)
             return;
         if (!stream.episode)
             stream.episode = Episode{when, when, 0};

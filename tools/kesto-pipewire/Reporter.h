@@ -90,6 +90,7 @@ private:
         StreamDescription description;
         Moment appearedAt;
         Fact<bool> running;
+        Moment setOffAt; // when it last began to run, be it after a dip
         Fact<std::optional<double>> volume;
         Fact<std::optional<StreamFormat>> format;
         Fact<std::string> devices;

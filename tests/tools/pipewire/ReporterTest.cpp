@@ -544,6 +544,18 @@ TEST_F(ReporterTest, CyclesMissedWhileStartingAreNoFault)
     EXPECT_THAT(news(), IsEmpty());
 }
 
+TEST_F(ReporterTest, CyclesMissedWhileSettingOffOnAnotherDeviceAreNoFaultEither)
+{
+    appearAndRun(stream, 1);
+    news();
+    halt(stream, 5);
+    run(stream, 5.002);
+    reporter.cycleWasLate(stream, at(5.03));
+    pass(20);
+
+    EXPECT_THAT(news(), IsEmpty());
+}
+
 TEST_F(ReporterTest, CyclesFromBeforeItAppearedWereAnothers)
 {
     appearAndRun(stream, 10);
