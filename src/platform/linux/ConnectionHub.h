@@ -9,6 +9,7 @@
 #include <array>
 #include <atomic>
 #include <cstdint>
+#include <thread>
 #include <vector>
 
 namespace platform {
@@ -28,6 +29,9 @@ struct ConnectionHub {
     FileDescriptor epoll; // watches the sockets; changed by any thread, waited for by the connection thread
     LogCategory& log;
     ConnectionCounters counters = {};
+
+    std::thread::id connectionThread = {}; // from its start on
+    [[nodiscard]] bool isConnectionThread() const { return connectionThread == std::this_thread::get_id(); }
 
     // Room for one read of one connection, used by the connection thread.
     std::array<char, mostReadAtOnce> readBuffer = {};

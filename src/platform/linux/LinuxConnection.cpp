@@ -4,6 +4,7 @@
 #include "platform/linux/SerialQueue.h"
 #include "platform/linux/SystemErrorText.h"
 
+#include <cassert>
 #include <cerrno>
 #include <fmt/format.h>
 #include <sys/epoll.h>
@@ -58,6 +59,7 @@ std::string LinuxConnection::description() const
 
 void LinuxConnection::resume()
 {
+    assert(hub_->isConnectionThread());
     const foundation::Lock lock(lock_);
     epoll_event event = {};
     event.events = watchedEvents_ = EPOLLIN | EPOLLRDHUP;
@@ -69,6 +71,7 @@ void LinuxConnection::resume()
 
 bool LinuxConnection::handle(std::uint32_t events)
 {
+    assert(hub_->isConnectionThread());
     constexpr std::uint32_t endings = EPOLLHUP | EPOLLRDHUP | EPOLLERR;
     if ((events & EPOLLOUT) != 0) {
         const foundation::Lock lock(lock_);
@@ -206,10 +209,11 @@ void LinuxConnection::write(std::string frames)
         return drop(frames.size());
     if (!output_.empty()) {
         output_ += frames; // behind what waits for room already
-        return;
+        watch();
+    } else {
+        output_ = std::move(frames);
+        writeOutput();
     }
-    output_ = std::move(frames);
-    writeOutput();
 }
 
 // Gives the socket what it takes.
@@ -287,6 +291,7 @@ void LinuxConnection::breakOff(std::string reason)
 
 void LinuxConnection::end(std::optional<std::string> interruptedBecause)
 {
+    assert(hub_->isConnectionThread());
     {
         const foundation::Lock lock(lock_);
         if (isOver_)

@@ -72,6 +72,7 @@ bool LinuxConnectionListener::watch(int operation, int descriptor, std::uint32_t
 void LinuxConnectionListener::resume()
 {
     assert(delegate_ != nullptr);
+    hub_->connectionThread = std::this_thread::get_id();
     resumeAccepting();
     if (listeningHandler_)
         listeningHandler_();

@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <array>
 #include <atomic>
+#include <filesystem>
 #include <fstream>
 #include <gtest/gtest.h>
 #include <latch>
@@ -44,6 +45,12 @@ std::string nameOfThisThread()
     std::array<char, 16> name = {};
     pthread_getname_np(pthread_self(), name.data(), name.size());
     return name.data();
+}
+
+std::size_t threadsOfTheProcess()
+{
+    return static_cast<std::size_t>(
+        std::distance(std::filesystem::directory_iterator("/proc/self/task"), std::filesystem::directory_iterator()));
 }
 
 int niceValue(id_t id)
@@ -122,10 +129,9 @@ protected:
     // Until the queue's thread sleeps, so that it runs nothing unless it is woken.
     void waitUntilAsleep()
     {
-        pid_t thread = 0;
-        queue->submit([&] { thread = gettid(); });
+        queue->submit([&] { queueThread = gettid(); });
         drain(*queue);
-        while (stateOf(thread) != 'S')
+        while (stateOf(queueThread) != 'S')
             std::this_thread::yield();
         SerialQueue::Helper helper;
         queue->submit([] { });
@@ -154,6 +160,7 @@ protected:
 
     std::vector<int> history;
     std::vector<std::thread::id> threads;
+    pid_t queueThread = 0;
     std::shared_ptr<WorkQueue> queue;
 };
 
@@ -264,15 +271,37 @@ TEST_F(TurnsTest, AHelperThatLeavesRunsWhatItHasSubmitted)
 TEST_F(TurnsTest, WhatIsSubmittedDuringAHelpedTurnGoesToTheQueuesThread)
 {
     SerialQueue::Helper helper;
+    const auto done = queues.makeSemaphore(0);
     queue->submit([&] {
         history.push_back(1);
         submit(2); // by the turn itself
-        std::jthread([&] { submit(3); }); // and by somebody else
+        std::jthread([&] { queue->submit([&] { done->signal(); }); }); // and by somebody else
     });
     helper.help();
+    done->wait(); // without help
     queue.reset();
-    EXPECT_EQ(history, (std::vector<int>{1, 0, 2, 3, 0}));
+    EXPECT_EQ(history, (std::vector<int>{1, 0, 2, 0}));
     EXPECT_NE(threads.back(), std::this_thread::get_id());
+}
+
+TEST_F(TurnsTest, TheQueuesThreadWaitsUntilAHelpedTurnHasEnded)
+{
+    SerialQueue::Helper helper;
+    std::jthread other;
+    queue->submit([&] {
+        submit(2);
+        std::atomic<pid_t> otherThread = 0;
+        other = std::jthread([&] {
+            otherThread = gettid();
+            queue.reset(); // wakes the queue's thread, which finds something to do
+        });
+        while (otherThread == 0 || stateOf(otherThread) != 'S' || stateOf(queueThread) != 'S')
+            std::this_thread::yield();
+        history.push_back(1);
+    });
+    helper.help();
+    other.join();
+    EXPECT_EQ(history, (std::vector<int>{1, 0, 2, 0}));
 }
 
 TEST_F(TurnsTest, ABurstGoesToTheQueuesThread)
@@ -426,24 +455,33 @@ TEST_F(WorkQueuesTest, PrioritiesFollowTheQualityOfServiceAsFarAsTheProcessMay)
 
 TEST_F(WorkQueuesTest, BackgroundItemsRunSideBySideOnAFewThreads)
 {
-    std::latch together(BackgroundQueue::mostThreads); // reached only if so many run at once
-    std::atomic<std::size_t> running = 0;
-    std::atomic<std::size_t> mostRunning = 0;
-    std::latch done(40);
-    for (std::size_t item = 0; item < 40; ++item) {
+    constexpr std::size_t items = 40;
+    const std::size_t threadsBefore = threadsOfTheProcess();
+    std::latch together(BackgroundQueue::mostThreads + 1); // reached only if so many run at once
+    std::latch done(items);
+    for (std::size_t item = 0; item < items; ++item) {
         queues.backgroundQueue().submit([&, item] {
-            const std::size_t now = ++running;
-            for (std::size_t most = mostRunning; most < now && !mostRunning.compare_exchange_weak(most, now);) { }
             if (item < BackgroundQueue::mostThreads)
                 together.arrive_and_wait();
             EXPECT_TRUE(queues.backgroundQueue().isCurrent());
-            --running;
             done.count_down();
         });
     }
+    EXPECT_EQ(threadsOfTheProcess() - threadsBefore, BackgroundQueue::mostThreads);
+    together.count_down();
     done.wait();
-    EXPECT_EQ(mostRunning, BackgroundQueue::mostThreads);
     EXPECT_FALSE(queues.backgroundQueue().isCurrent());
+}
+
+TEST_F(WorkQueuesTest, NoThreadIsStartedBeforeThereIsWorkForIt)
+{
+    const std::size_t threadsBefore = threadsOfTheProcess();
+    LinuxWorkQueues others;
+    EXPECT_EQ(threadsOfTheProcess(), threadsBefore);
+    const auto done = queues.makeSemaphore(0);
+    others.backgroundQueue().submit([&] { done->signal(); });
+    done->wait();
+    EXPECT_EQ(threadsOfTheProcess(), threadsBefore + 1);
 }
 
 TEST_F(WorkQueuesTest, BackgroundItemsMaySubmitAndAllRunBeforeTheQueueGoes)
@@ -475,8 +513,9 @@ TEST_F(WorkQueuesTest, DelayedItemsRunInTheOrderOfTheirTimesAndNotBefore)
             done.count_down();
         });
     };
-    later(30ms, 4);
-    later(20ms, 2); // before the one that the thread waits for
+    queues.submitAfter(24h, *queue, [] { ADD_FAILURE(); });
+    later(30ms, 4); // before the one that the thread waits for
+    later(20ms, 2);
     later(20ms, 3);
     later(60ms, 5);
     later(0ms, 1);
