@@ -226,7 +226,7 @@ bool AnalyticsStore::take(Batch& batch)
         isAsleep_ = false;
         std::swap(configuration, newConfiguration_);
         std::swap(batch, waiting_);
-        isWriting_ = true;
+        isWriting_ = !batch.empty();
         room_.notifyAll();
     }
     if (configuration)

@@ -1,0 +1,83 @@
+#include "platform/linux/LinuxPlatform.h"
+
+#include "platform/linux/StoreReader.h"
+#include "platform/linux/TemporaryDirectory.h"
+
+#include <future>
+#include <gtest/gtest.h>
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+
+class LinuxPlatformTest : public testing::Test {
+protected:
+    LaunchConfiguration launch()
+    {
+        LaunchConfiguration configuration;
+        configuration.stateDirectory = make("state");
+        configuration.logsDirectory = make("logs");
+        configuration.configurationDirectory = make("etc");
+        configuration.runtimeDirectory = make("run");
+        return configuration;
+    }
+    fs::path make(const char* name)
+    {
+        fs::create_directories(directory.path() / name);
+        return directory.path() / name;
+    }
+
+    support::TemporaryDirectory directory;
+};
+
+TEST_F(LinuxPlatformTest, EveryProviderReadsWhatTheLaunchConfigurationNames)
+{
+    fs::create_directories(make("etc") / "preferences");
+    support::writeFile(make("etc") / "preferences" / "com.quarn.kesto.toml", "device_name = \"Kitchen\"");
+    support::writeFile(make("etc") / "feature-flags.toml", "[Sonalis]\nTracing = true");
+    support::writeFile(make("etc") / "device.toml", "InternalBuild = true");
+    support::writeFile(make("etc") / "analytics.toml", "used = [\"a.*\"]");
+    LinuxPlatform providers(launch());
+    const Platform platform = providers.platform();
+    EXPECT_EQ(platform.preferences.value("com.quarn.kesto", "device_name"), foundation::Value("Kitchen"));
+    EXPECT_TRUE(platform.featureFlags.isEnabled("Sonalis", "Tracing"));
+    EXPECT_EQ(platform.deviceProperties.boolean("InternalBuild"), true);
+    EXPECT_TRUE(platform.analytics.isAnalyticsEventUsed("a.b"));
+    EXPECT_FALSE(platform.analytics.isAnalyticsEventUsed("com.quarn.kesto.Playback.Start"));
+    EXPECT_EQ(platform.fileSystem.diagnosticLogRoot(), make("logs"));
+    EXPECT_GT(platform.clock.secondsSince1970(), 1'700'000'000);
+    EXPECT_EQ(platform.processTable.entry(platform.processTable.ownProcessIdentifier())->commandName,
+              platform.processTable.ownProcessName());
+}
+
+TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)
+{
+    LinuxPlatform providers(launch());
+    const Platform platform = providers.platform();
+    const auto queue = platform.workQueues.makeSerialQueue("com.quarn.kesto.test", QualityOfService::UserInteractive);
+    std::promise<void> sent;
+    queue->submit([&] {
+        platform.analytics.sendAnalyticsEventLazy("com.quarn.kesto.test", [] { return foundation::Dictionary(); });
+        sent.set_value();
+    });
+    sent.get_future().wait();
+    std::promise<void> turnEnded; // the turn of the next item begins when that of the first has ended
+    queue->submit([&] { turnEnded.set_value(); });
+    turnEnded.get_future().wait();
+    providers.analyticsStore().flush();
+    EXPECT_EQ(support::StoreReader(directory.path() / "state" / "analytics.sqlite3").eventCount(), 1);
+}
+
+TEST_F(LinuxPlatformTest, WhatWasSentIsKeptWhenThePlatformEnds)
+{
+    {
+        LinuxPlatform providers(launch());
+        providers.platform().analytics.sendAnalyticsEventLazy("com.quarn.kesto.test",
+                                                              [] { return foundation::Dictionary(); });
+    }
+    EXPECT_EQ(support::StoreReader(directory.path() / "state" / "analytics.sqlite3").eventCount(), 1);
+}
+
+} // namespace
+} // namespace platform
