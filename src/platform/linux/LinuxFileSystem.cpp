@@ -2,6 +2,7 @@
 
 #include "foundation/Format.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <fcntl.h>
 #include <sys/random.h>
@@ -78,21 +79,30 @@ std::string temporaryFileName()
     return foundation::format(".kestod-{:016x}.tmp", number);
 }
 
+// Makes the folder with exactly these permissions, unless something stands there.
+std::error_code makeIfMissing(int parent, const char* name, unsigned permissions)
+{
+    if (::mkdirat(parent, name, permissions) != 0)
+        return errno == EEXIST ? std::error_code() : lastError();
+    // The umask took its part, and is the process's and not to be touched.
+    return ::fchmodat(parent, name, permissions, AT_SYMLINK_NOFOLLOW) == 0 ? std::error_code() : lastError();
+}
+
 } // namespace
 
-template <typename Step>
-std::expected<FileDescriptor, std::error_code> LinuxFileSystem::openDirectory(const std::filesystem::path& path,
-                                                                              Step step) const
+std::expected<FileDescriptor, std::error_code>
+LinuxFileSystem::openDirectory(const std::filesystem::path& path, std::optional<unsigned> permissionsOfMissing) const
 {
     const std::filesystem::path below = path.lexically_relative(diagnosticLogRoot_);
-    if (below.empty() || *below.begin() == "..")
+    if (below.empty() || std::ranges::find(below, "..") != below.end())
         return std::unexpected(std::make_error_code(std::errc::invalid_argument));
     FileDescriptor directory(::open(diagnosticLogRoot_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
     if (!directory)
         return std::unexpected(lastError());
     for (const std::filesystem::path& name : below) {
-        if (std::expected<void, std::error_code> stepped = step(directory.get(), name.c_str()); !stepped)
-            return std::unexpected(stepped.error());
+        if (permissionsOfMissing)
+            if (const auto error = makeIfMissing(directory.get(), name.c_str(), *permissionsOfMissing))
+                return std::unexpected(error);
         FileDescriptor next(::openat(directory.get(), name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
         if (!next)
             return std::unexpected(lastError());
@@ -104,16 +114,7 @@ std::expected<FileDescriptor, std::error_code> LinuxFileSystem::openDirectory(co
 std::expected<void, std::error_code> LinuxFileSystem::createDirectories(const std::filesystem::path& path,
                                                                         unsigned permissions)
 {
-    const auto make = [permissions](int parent, const char* name) -> std::expected<void, std::error_code> {
-        if (::mkdirat(parent, name, permissions) == 0) { // less the umask, which is the process's and not to be touched
-            if (::fchmodat(parent, name, permissions, AT_SYMLINK_NOFOLLOW) != 0)
-                return std::unexpected(lastError());
-        } else if (errno != EEXIST) {
-            return std::unexpected(lastError());
-        }
-        return {};
-    };
-    if (auto opened = openDirectory(path, make); !opened)
+    if (const auto opened = openDirectory(path, permissions); !opened)
         return std::unexpected(opened.error());
     return {};
 }
@@ -122,8 +123,7 @@ std::expected<std::unique_ptr<AtomicFile>, std::error_code>
 LinuxFileSystem::createAtomically(const std::filesystem::path& path)
 {
     constexpr mode_t readableByAll = 0644;
-    const auto pass = [](int, const char*) -> std::expected<void, std::error_code> { return {}; };
-    auto directory = openDirectory(path.parent_path(), pass);
+    auto directory = openDirectory(path.parent_path(), std::nullopt);
     if (!directory)
         return std::unexpected(directory.error());
     std::string name = temporaryFileName();

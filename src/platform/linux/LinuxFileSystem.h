@@ -12,6 +12,8 @@
 #include "platform/FileSystem.h"
 #include "platform/linux/FileDescriptor.h"
 
+#include <optional>
+
 namespace platform {
 
 // Any thread.
@@ -28,10 +30,9 @@ public:
     createAtomically(const std::filesystem::path& path) override;
 
 private:
-    // Calls `step` with the folder before it and its name for each folder on the way, before it is opened.
-    template <typename Step>
-    [[nodiscard]] std::expected<FileDescriptor, std::error_code> openDirectory(const std::filesystem::path& path,
-                                                                               Step step) const;
+    // Steps down from the root, and makes the folders on the way that are missing, if there are permissions for them.
+    [[nodiscard]] std::expected<FileDescriptor, std::error_code>
+    openDirectory(const std::filesystem::path& path, std::optional<unsigned> permissionsOfMissing) const;
 
     const std::filesystem::path diagnosticLogRoot_;
 };

@@ -1,0 +1,290 @@
+// Folders and files on the real file system: permissions, links that others put there, and disks that are full.
+#include "platform/linux/LinuxFileSystem.h"
+#include "platform/linux/TemporaryDirectory.h"
+
+#include <csignal>
+#include <fcntl.h>
+#include <gmock/gmock.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace {
+
+namespace fs = std::filesystem;
+using platform::LinuxFileSystem;
+using testing::Each;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::UnorderedElementsAre;
+
+class FileSystem : public testing::Test {
+protected:
+    // What stands in a folder, hidden files too.
+    static std::vector<std::string> namesIn(const fs::path& path)
+    {
+        std::vector<std::string> names;
+        for (const auto& entry : fs::directory_iterator(path))
+            names.push_back(entry.path().filename());
+        return names;
+    }
+    static unsigned permissionsOf(const fs::path& path)
+    {
+        struct stat status = {};
+        EXPECT_EQ(::lstat(path.c_str(), &status), 0) << path;
+        return status.st_mode & 07777U;
+    }
+    std::expected<void, std::error_code> write(const fs::path& path, std::string_view text)
+    {
+        auto file = files.createAtomically(path);
+        if (!file)
+            return std::unexpected(file.error());
+        (*file)->write(text);
+        return (*file)->commit();
+    }
+    // Runs in a process of its own, whose limits and rights it may change; true when `body` is.
+    template <typename Body> static bool inChild(Body body)
+    {
+        const pid_t child = ::fork();
+        if (child == 0)
+            ::_exit(body() ? 0 : 1);
+        int status = 0;
+        EXPECT_EQ(::waitpid(child, &status, 0), child);
+        return WIFEXITED(status) && WEXITSTATUS(status) == 0;
+    }
+    // Gives up root's right to go everywhere.
+    static bool becomeNobody()
+    {
+        constexpr uid_t nobody = 65534;
+        return ::geteuid() != 0 || (::setegid(nobody) == 0 && ::seteuid(nobody) == 0);
+    }
+
+    const support::TemporaryDirectory directory;
+    const fs::path root = directory.path();
+    LinuxFileSystem files{root};
+};
+
+// --- folders
+
+TEST_F(FileSystem, MakesEveryMissingFolderWithExactlyThePermissionsWhateverTheUmask)
+{
+    for (const mode_t mask : {0U, 022U, 077U, 0777U}) {
+        const mode_t before = ::umask(mask);
+        const fs::path top = root / std::to_string(mask);
+        const auto made = files.createDirectories(top / "Audio/Reporting", 0777);
+        ::umask(before);
+        EXPECT_TRUE(made) << made.error().message();
+        for (const fs::path& folder : {top, top / "Audio", top / "Audio/Reporting"})
+            EXPECT_EQ(permissionsOf(folder), 0777U) << folder;
+    }
+    ASSERT_TRUE(files.createDirectories(root / "others", 0750));
+    EXPECT_EQ(permissionsOf(root / "others"), 0750U);
+}
+
+TEST_F(FileSystem, LeavesFoldersThatExistAsTheyAre)
+{
+    fs::create_directory(root / "Audio");
+    ASSERT_EQ(::chmod((root / "Audio").c_str(), 0750), 0);
+    ASSERT_TRUE(files.createDirectories(root / "Audio/Reporting", 0777));
+    ASSERT_TRUE(files.createDirectories(root / "Audio/Reporting", 0777));
+    EXPECT_EQ(permissionsOf(root / "Audio"), 0750U);
+    EXPECT_EQ(permissionsOf(root / "Audio/Reporting"), 0777U);
+    ASSERT_TRUE(files.createDirectories(root, 0777));
+    EXPECT_NE(permissionsOf(root), 0777U) << "the root is not the service's to open";
+}
+
+TEST_F(FileSystem, FollowsALinkToTheRootWhichIsTheAdministrators)
+{
+    fs::create_directory(root / "real");
+    fs::create_directory_symlink("real", root / "link");
+    LinuxFileSystem throughLink(root / "link");
+    ASSERT_TRUE(throughLink.createDirectories(root / "link/Audio", 0777));
+    auto file = throughLink.createAtomically(root / "link/Audio/a.json");
+    ASSERT_TRUE(file);
+    ASSERT_TRUE((*file)->commit());
+    EXPECT_TRUE(fs::exists(root / "real/Audio/a.json"));
+}
+
+TEST_F(FileSystem, TakesNoLinkForAFolder)
+{
+    fs::create_directory(root / "elsewhere");
+    fs::create_directory_symlink("elsewhere", root / "Audio");
+    const auto made = files.createDirectories(root / "Audio/Reporting", 0777);
+    ASSERT_FALSE(made);
+    EXPECT_EQ(made.error(), std::errc::not_a_directory);
+    EXPECT_THAT(namesIn(root / "elsewhere"), IsEmpty());
+
+    fs::create_directories(root / "elsewhere/Reporting");
+    EXPECT_EQ(write(root / "Audio/Reporting/a.json", "text").error(), std::errc::not_a_directory);
+    EXPECT_EQ(write(root / "Audio/a.json", "text").error(), std::errc::not_a_directory);
+    EXPECT_THAT(namesIn(root / "elsewhere"), ElementsAre("Reporting"));
+    EXPECT_THAT(namesIn(root / "elsewhere/Reporting"), IsEmpty());
+}
+
+TEST_F(FileSystem, MakesNoFolderWhereADanglingLinkStands)
+{
+    fs::create_directory_symlink("nowhere", root / "Audio");
+    EXPECT_FALSE(files.createDirectories(root / "Audio", 0777));
+    EXPECT_FALSE(fs::exists(root / "nowhere"));
+}
+
+TEST_F(FileSystem, SaysWhyAFolderCannotBeMade)
+{
+    support::writeFile(root / "file", "");
+    EXPECT_EQ(files.createDirectories(root / "file", 0777).error(), std::errc::not_a_directory);
+    EXPECT_EQ(files.createDirectories(root / "file/inside", 0777).error(), std::errc::not_a_directory);
+    EXPECT_EQ(files.createDirectories(root / std::string(300, 'x'), 0777).error(), std::errc::filename_too_long);
+    EXPECT_EQ(LinuxFileSystem(root / "gone").createDirectories(root / "gone/Audio", 0777).error(),
+              std::errc::no_such_file_or_directory);
+    ASSERT_EQ(::chmod(root.c_str(), 0555), 0);
+    EXPECT_TRUE(inChild([&] {
+        return becomeNobody()
+            && files.createDirectories(root / "Audio", 0777).error() == std::errc::permission_denied;
+    }));
+    ASSERT_EQ(::chmod(root.c_str(), 0700), 0);
+}
+
+TEST_F(FileSystem, KeepsBelowItsRoot)
+{
+    const fs::path outside = root.parent_path() / "kesto-test-outside";
+    for (const fs::path& path : {outside, root / "..", root / "../kesto-test-outside", root / "a/../../x", fs::path("relative"),
+                                 fs::path(), fs::path("/")}) {
+        EXPECT_EQ(files.createDirectories(path, 0777).error(), std::errc::invalid_argument) << path;
+        EXPECT_EQ(write(path / "file", "text").error(), std::errc::invalid_argument) << path;
+    }
+    EXPECT_FALSE(fs::exists(outside));
+}
+
+// --- files
+
+TEST_F(FileSystem, WritesAFileAtOnceWhenItIsCommitted)
+{
+    auto file = files.createAtomically(root / "a.json");
+    ASSERT_TRUE(file);
+    (*file)->write("one ");
+    (*file)->write("");
+    (*file)->write("and two");
+    EXPECT_FALSE(fs::exists(root / "a.json")) << "not before";
+    ASSERT_TRUE((*file)->commit());
+    EXPECT_EQ(support::readFile(root / "a.json"), "one and two");
+    file->reset();
+    EXPECT_THAT(namesIn(root), ElementsAre("a.json"));
+    EXPECT_EQ(permissionsOf(root / "a.json") & 0600U, 0600U);
+}
+
+TEST_F(FileSystem, TakesThePlaceOfAnEarlierFileAndLeavesItsReadersTheOldOne)
+{
+    ASSERT_TRUE(write(root / "a.json", "old"));
+    std::ifstream reader(root / "a.json");
+    ASSERT_TRUE(write(root / "a.json", "new"));
+    std::string seen;
+    reader >> seen;
+    EXPECT_EQ(seen, "old");
+    EXPECT_EQ(support::readFile(root / "a.json"), "new");
+}
+
+TEST_F(FileSystem, LeavesNothingOfAFileThatIsNotCommitted)
+{
+    ASSERT_TRUE(write(root / "a.json", "old"));
+    {
+        auto file = files.createAtomically(root / "a.json");
+        ASSERT_TRUE(file);
+        (*file)->write("half of the n");
+    }
+    EXPECT_THAT(namesIn(root), ElementsAre("a.json"));
+    EXPECT_EQ(support::readFile(root / "a.json"), "old");
+}
+
+TEST_F(FileSystem, BeginsAnewWhenItIsCleared)
+{
+    auto file = files.createAtomically(root / "a.json");
+    ASSERT_TRUE(file);
+    (*file)->write(std::string(100'000, 'x'));
+    (*file)->clear();
+    ASSERT_TRUE((*file)->commit());
+    EXPECT_EQ(support::readFile(root / "a.json"), "");
+    auto other = files.createAtomically(root / "a.json");
+    (*other)->write("long before");
+    (*other)->clear();
+    (*other)->write("short");
+    ASSERT_TRUE((*other)->commit());
+    EXPECT_EQ(support::readFile(root / "a.json"), "short");
+}
+
+TEST_F(FileSystem, WritesTwoFilesAtATime)
+{
+    auto first = files.createAtomically(root / "a.json");
+    auto second = files.createAtomically(root / "a.json");
+    ASSERT_TRUE(first && second);
+    (*first)->write("first");
+    (*second)->write("second");
+    ASSERT_TRUE((*second)->commit());
+    ASSERT_TRUE((*first)->commit());
+    EXPECT_EQ(support::readFile(root / "a.json"), "first");
+    first->reset();
+    second->reset();
+    EXPECT_THAT(namesIn(root), ElementsAre("a.json"));
+}
+
+TEST_F(FileSystem, ReplacesALinkInThePlaceOfAFileAndNotWhatItLeadsTo)
+{
+    support::writeFile(root / "precious", "kept");
+    fs::create_symlink("precious", root / "a.json");
+    ASSERT_TRUE(write(root / "a.json", "new"));
+    EXPECT_EQ(support::readFile(root / "precious"), "kept");
+    EXPECT_FALSE(fs::is_symlink(root / "a.json"));
+    EXPECT_EQ(support::readFile(root / "a.json"), "new");
+}
+
+TEST_F(FileSystem, SaysWhyAFileCannotBeWritten)
+{
+    EXPECT_EQ(write(root / "missing/a.json", "text").error(), std::errc::no_such_file_or_directory);
+    EXPECT_EQ(write(root / std::string(300, 'x'), "text").error(), std::errc::filename_too_long);
+    fs::create_directory(root / "folder");
+    EXPECT_EQ(write(root / "folder", "text").error(), std::errc::is_a_directory);
+    EXPECT_THAT(namesIn(root), ElementsAre("folder")) << "nothing of the attempts is left";
+    ASSERT_EQ(::chmod((root / "folder").c_str(), 0555), 0);
+    ASSERT_EQ(::chmod(root.c_str(), 0755), 0);
+    EXPECT_TRUE(inChild([&] {
+        return becomeNobody() && write(root / "folder/a.json", "text").error() == std::errc::permission_denied;
+    }));
+}
+
+TEST_F(FileSystem, KeepsTheOldFileWhenTheNewOneDoesNotFit)
+{
+    ASSERT_TRUE(write(root / "a.json", "old"));
+    EXPECT_TRUE(inChild([&] {
+        std::signal(SIGXFSZ, SIG_IGN);
+        const rlimit atMost{10'000, 10'000};
+        if (::setrlimit(RLIMIT_FSIZE, &atMost) != 0)
+            return false;
+        auto file = files.createAtomically(root / "a.json");
+        if (!file)
+            return false;
+        (*file)->write(std::string(9'000, 'x'));
+        (*file)->write(std::string(9'000, 'x'));
+        (*file)->write("the rest is not even tried");
+        const auto written = (*file)->commit();
+        file->reset();
+        return !written && written.error() == std::errc::file_too_large;
+    }));
+    EXPECT_EQ(support::readFile(root / "a.json"), "old");
+    EXPECT_THAT(namesIn(root), ElementsAre("a.json"));
+}
+
+TEST_F(FileSystem, StaysInAFolderThatIsMovedAwayMeanwhile)
+{
+    fs::create_directory(root / "Audio");
+    fs::create_directory(root / "elsewhere");
+    auto file = files.createAtomically(root / "Audio/a.json");
+    ASSERT_TRUE(file);
+    (*file)->write("text");
+    fs::rename(root / "Audio", root / "moved");
+    fs::create_directory_symlink("elsewhere", root / "Audio");
+    ASSERT_TRUE((*file)->commit());
+    EXPECT_THAT(namesIn(root / "elsewhere"), IsEmpty());
+    EXPECT_THAT(namesIn(root / "moved"), ElementsAre("a.json"));
+}
+
+} // namespace
