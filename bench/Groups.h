@@ -10,6 +10,7 @@ void measureRoundTrip(const Options& options, Report& report);
 void measurePipeline(const Options& options, Report& report);
 void measureStored(const Options& options, Report& report);
 void measureSession(const Options& options, Report& report);
+void measureSessionEnd(const Options& options, Report& report);
 void measureLookup(const Options& options, Report& report);
 void measureIdle(const Options& options, Report& report);
 void measureStart(const Options& options, Report& report);

@@ -1,6 +1,7 @@
 // The platform of what is measured inside this process: nothing on it costs time, so that the service's own work is
 // what remains. Whatever is submitted to a queue is done at once; nobody wants any event; nothing is logged that is
-// not logged by default, and that goes nowhere.
+// not logged by default, and that goes nowhere. There are no files, unless a file system is given: then it is that of
+// an internal build, which writes some.
 #pragma once
 
 #include "platform/Absent.h"
@@ -10,7 +11,8 @@ namespace bench {
 
 class InProcessPlatform {
 public:
-    InProcessPlatform()
+    explicit InProcessPlatform(platform::FileSystem* filesOfInternalBuild = nullptr)
+        : deviceProperties_(filesOfInternalBuild != nullptr)
     {
         platform::install({.log = log_,
                            .clock = clock_,
@@ -26,7 +28,7 @@ public:
                            .bugCapture = bugCapture_,
                            .kernelTrace = kernelTrace_,
                            .performanceWriter = performanceWriter_,
-                           .fileSystem = fileSystem_});
+                           .fileSystem = filesOfInternalBuild != nullptr ? *filesOfInternalBuild : fileSystem_});
     }
     ~InProcessPlatform() { platform::uninstall(); }
     InProcessPlatform(const InProcessPlatform&) = delete;
@@ -69,7 +71,12 @@ private:
         [[nodiscard]] bool isEnabled(std::string_view, std::string_view) const override { return false; }
     };
     class DeviceProperties final : public platform::DeviceProperties {
-        [[nodiscard]] std::optional<bool> boolean(std::string_view) const override { return std::nullopt; }
+    public:
+        explicit DeviceProperties(bool isInternalBuild) : isInternalBuild_(isInternalBuild) { }
+
+    private:
+        [[nodiscard]] std::optional<bool> boolean(std::string_view) const override { return isInternalBuild_; }
+        const bool isInternalBuild_;
     };
     class ProcessTable final : public platform::ProcessTable {
         [[nodiscard]] std::int32_t ownProcessIdentifier() const override { return 1; }

@@ -25,6 +25,7 @@ constexpr std::array groups{
     Group{"pipeline", "messages a second, none stored", measurePipeline},
     Group{"stored", "messages a second that become stored events", measureStored},
     Group{"session", "recording a million messages: time and memory", measureSession},
+    Group{"end", "the end of a session of a million messages", measureSessionEnd},
     Group{"lookup", "finding a session among 10,000 clients", measureLookup},
     Group{"idle", "wake-ups and memory with nothing to do", measureIdle},
     Group{"start", "from starting the process to its first answer", measureStart},

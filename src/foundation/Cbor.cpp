@@ -21,64 +21,86 @@ using enum CborHead::Simple;
 constexpr char breakByte = '\xFF';
 constexpr std::uint64_t epochDateTag = 1;
 
-template <typename Integer> void appendBigEndian(Integer value, std::string& out)
+// The longest head: the first byte and a number of 64 bits.
+constexpr std::size_t longestHead = 9;
+
+template <typename Integer> char* putBigEndian(Integer value, char* place) noexcept
 {
-    std::array<char, sizeof value> bytes;
     if constexpr (std::endian::native == std::endian::little)
         value = std::byteswap(value);
-    std::memcpy(bytes.data(), &value, sizeof value);
-    out.append(bytes.data(), bytes.size());
+    std::memcpy(place, &value, sizeof value);
+    return place + sizeof value;
+}
+
+// Writes the shortest head; returns where it ends.
+char* putHead(Major major, std::uint64_t argument, char* place) noexcept
+{
+    const auto put = [major, &place](unsigned additional) {
+        *place++ = static_cast<char>(static_cast<unsigned>(major) << 5 | additional);
+    };
+    if (argument < 24) {
+        put(static_cast<unsigned>(argument));
+        return place;
+    }
+    if (argument <= std::numeric_limits<std::uint8_t>::max()) {
+        put(24);
+        return putBigEndian(static_cast<std::uint8_t>(argument), place);
+    }
+    if (argument <= std::numeric_limits<std::uint16_t>::max()) {
+        put(25);
+        return putBigEndian(static_cast<std::uint16_t>(argument), place);
+    }
+    if (argument <= std::numeric_limits<std::uint32_t>::max()) {
+        put(26);
+        return putBigEndian(static_cast<std::uint32_t>(argument), place);
+    }
+    put(27);
+    return putBigEndian(argument, place);
+}
+
+// Makes the text longer by what `put` writes to the place it is given, `most` bytes at most; it returns where it
+// stopped. One step on the string instead of one a byte.
+template <typename Put> void append(std::size_t most, std::string& out, Put put)
+{
+    out.resize_and_overwrite(out.size() + most, [&put, before = out.size()](char* bytes, std::size_t) {
+        return static_cast<std::size_t>(put(bytes + before) - bytes);
+    });
 }
 
 void appendHead(Major major, std::uint64_t argument, std::string& out)
 {
-    const auto first = [major](unsigned additional) {
-        return static_cast<char>(static_cast<unsigned>(major) << 5 | additional);
-    };
-    if (argument < 24) {
-        out.push_back(first(static_cast<unsigned>(argument)));
-    } else if (argument <= std::numeric_limits<std::uint8_t>::max()) {
-        out.push_back(first(24));
-        out.push_back(static_cast<char>(argument));
-    } else if (argument <= std::numeric_limits<std::uint16_t>::max()) {
-        out.push_back(first(25));
-        appendBigEndian(static_cast<std::uint16_t>(argument), out);
-    } else if (argument <= std::numeric_limits<std::uint32_t>::max()) {
-        out.push_back(first(26));
-        appendBigEndian(static_cast<std::uint32_t>(argument), out);
-    } else {
-        out.push_back(first(27));
-        appendBigEndian(argument, out);
-    }
+    append(longestHead, out, [&](char* place) { return putHead(major, argument, place); });
 }
 
-void appendSimple(Head::Simple simple, std::string& out)
+void appendBytes(Major major, std::string_view bytes, std::string& out)
 {
-    out.push_back(static_cast<char>(static_cast<unsigned>(Major::Simple) << 5 | simple));
+    append(longestHead + bytes.size(), out, [&](char* place) {
+        char* const begin = putHead(major, bytes.size(), place);
+        return begin + bytes.copy(begin, bytes.size());
+    });
 }
 
-void appendFloat64(double value, std::string& out)
+char* putSimple(Head::Simple simple, char* place) noexcept
 {
-    appendSimple(Float64, out);
-    appendBigEndian(std::bit_cast<std::uint64_t>(value), out);
+    *place = static_cast<char>(static_cast<unsigned>(Major::Simple) << 5 | simple);
+    return place + 1;
 }
 
-void appendNumber(Number number, std::string& out)
+char* putNumber(Number number, char* place) noexcept
 {
     switch (number.kind()) {
-    case Number::Kind::Boolean: return appendSimple(number.booleanValue() ? True : False, out);
+    case Number::Kind::Boolean: return putSimple(number.booleanValue() ? True : False, place);
     case Number::Kind::Float32:
-        appendSimple(Float32, out);
-        return appendBigEndian(std::bit_cast<std::uint32_t>(static_cast<float>(number.doubleValue())), out);
-    case Number::Kind::Float64: return appendFloat64(number.doubleValue(), out);
-    case Number::Kind::Unsigned64: return appendHead(Major::Unsigned, *number.exactly<std::uint64_t>(), out);
+        return putBigEndian(std::bit_cast<std::uint32_t>(static_cast<float>(number.doubleValue())),
+                            putSimple(Float32, place));
+    case Number::Kind::Float64:
+        return putBigEndian(std::bit_cast<std::uint64_t>(number.doubleValue()), putSimple(Float64, place));
+    case Number::Kind::Unsigned64: return putHead(Major::Unsigned, *number.exactly<std::uint64_t>(), place);
     case Number::Kind::Signed64: break;
     }
     const std::int64_t value = number.int64Value();
-    if (value >= 0)
-        appendHead(Major::Unsigned, static_cast<std::uint64_t>(value), out);
-    else
-        appendHead(Major::Negative, ~static_cast<std::uint64_t>(value), out);
+    return value >= 0 ? putHead(Major::Unsigned, static_cast<std::uint64_t>(value), place)
+                      : putHead(Major::Negative, ~static_cast<std::uint64_t>(value), place);
 }
 
 float widenHalf(std::uint16_t half) noexcept // RFC 8949, appendix D
@@ -116,8 +138,7 @@ void appendCborInteger(std::uint64_t value, std::string& out)
 
 void appendCborText(std::string_view text, std::string& out)
 {
-    appendHead(Major::Text, text.size(), out);
-    out += text;
+    appendBytes(Major::Text, text, out);
 }
 
 void appendCborArrayHead(std::uint64_t count, std::string& out)
@@ -150,8 +171,9 @@ void appendCbor(const Value& value, std::string& out)
 {
     switch (value.kind()) {
     case Value::Kind::Null: return appendCborNull(out);
-    case Value::Kind::Number: return appendNumber(*value.number(), out);
-    case Value::Kind::String: return appendCborText(*value.string(), out);
+    case Value::Kind::Number:
+        return append(longestHead, out, [&](char* place) { return putNumber(*value.number(), place); });
+    case Value::Kind::String: return appendCborText(value.stringView(), out);
     case Value::Kind::Dictionary: return appendCbor(*value.dictionary(), out);
     case Value::Kind::Array: {
         const Array array = *value.array();
@@ -160,15 +182,10 @@ void appendCbor(const Value& value, std::string& out)
             appendCbor(element, out);
         return;
     }
-    case Value::Kind::Data: {
-        const Data data = *value.data();
-        appendHead(Major::Bytes, data.bytes.view().size(), out);
-        out += data.bytes.view();
-        return;
-    }
+    case Value::Kind::Data: return appendBytes(Major::Bytes, value.data()->bytes, out);
     case Value::Kind::Date:
         appendHead(Major::Tag, epochDateTag, out);
-        return appendFloat64(value.date()->secondsSince1970, out);
+        return appendCbor(Value(value.date()->secondsSince1970), out);
     }
 }
 
@@ -313,14 +330,21 @@ private:
         return chunks_;
     }
 
+    // Whether what `readBytes` returned for a text is one. Of an indefinite length, its chunks are.
+    [[nodiscard]] static bool isText(const Head& head, std::string_view bytes) noexcept
+    {
+        return head.isIndefinite() || isValidUtf8(bytes);
+    }
+
     std::string_view readText(const Head& head)
     {
         const std::string_view text = readBytes(head);
-        if (!head.isIndefinite() && !isValidUtf8(text))
+        if (!isText(head, text))
             fail(CborError::InvalidUtf8);
         return text;
     }
 
+    // A key that is remembered was looked at when it came first.
     String readKey()
     {
         const Head head = readHead();
@@ -328,7 +352,15 @@ private:
             fail(CborError::KeyNotText);
             return {};
         }
-        return decoder_.internKey(readText(head));
+        const std::string_view key = readBytes(head);
+        String* const place = decoder_.placeOf(key);
+        if (place != nullptr && *place == key)
+            return *place;
+        if (!isText(head, key)) {
+            fail(CborError::InvalidUtf8);
+            return {};
+        }
+        return place == nullptr ? String(key) : *place = String(key);
     }
 
     // Room for what a container claims to hold, as long as the claim is modest: it is not to be trusted.
@@ -378,18 +410,39 @@ std::expected<Value, CborError> CborDecoder::decode(std::string_view bytes, unsi
     return CborReader(bytes, *this).readAll(maximumDepth);
 }
 
-String CborDecoder::internKey(std::string_view key)
+namespace {
+
+// Eight characters at a time, the last eight perhaps overlapping those before.
+std::uint64_t hashOf(std::string_view key) noexcept
+{
+    constexpr std::uint64_t multiplier = 0x9E3779B97F4A7C15; // odd, its bits well mixed
+    std::uint64_t hash = key.size();
+    const auto add = [&hash](const char* bytes, std::size_t count) {
+        std::uint64_t word = 0;
+        std::memcpy(&word, bytes, count);
+        hash = (hash ^ word) * multiplier;
+        hash ^= hash >> 32;
+    };
+    constexpr std::size_t wordSize = sizeof hash;
+    if (key.size() < wordSize) {
+        add(key.data(), key.size());
+        return hash;
+    }
+    for (std::size_t at = 0; at + wordSize < key.size(); at += wordSize)
+        add(key.data() + at, wordSize);
+    add(key.data() + key.size() - wordSize, wordSize);
+    return hash;
+}
+
+} // namespace
+
+String* CborDecoder::placeOf(std::string_view key)
 {
     if (key.empty() || key.size() > longestRememberedKey)
-        return String(key);
-    std::size_t hash = key.size();
-    for (const char character : key)
-        hash = hash * 31 + static_cast<std::uint8_t>(character);
-    keys_.resize(rememberedKeys);
-    String& remembered = keys_[(hash ^ hash >> 8) % rememberedKeys];
-    if (remembered.view() != key)
-        remembered = String(key);
-    return remembered;
+        return nullptr;
+    if (keys_.empty())
+        keys_.resize(rememberedKeys);
+    return &keys_[hashOf(key) % rememberedKeys];
 }
 
 } // namespace foundation

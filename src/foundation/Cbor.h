@@ -63,7 +63,8 @@ public:
 
 private:
     friend class CborReader;
-    [[nodiscard]] String internKey(std::string_view key);
+    // Where the key is remembered, or is to be; null for keys that are not.
+    [[nodiscard]] String* placeOf(std::string_view key);
 
     static constexpr std::size_t longestRememberedKey = 64;
     static constexpr std::size_t rememberedKeys = 256;

@@ -3,7 +3,6 @@
 #include <algorithm>
 #include <cstdlib>
 #include <new>
-#include <utility>
 
 namespace foundation {
 
@@ -17,9 +16,8 @@ String StringBuilder::finish() &&
     if (size_ == 0)
         return {};
     setCapacity(size_);
-    const std::size_t size = std::exchange(size_, 0);
     capacity_ = 0;
-    return String(Reference<StringObject>::adopt(StringObject::createIn(memory_.release(), size)));
+    return String(Reference<StringObject>::adopt(StringObject::createIn(memory_.release(), std::exchange(size_, 0))));
 }
 
 void StringBuilder::grow(std::size_t additional)

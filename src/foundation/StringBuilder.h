@@ -9,12 +9,29 @@
 #include <cstring>
 #include <memory>
 #include <string_view>
+#include <utility>
 
 namespace foundation {
 
 // One thread at a time.
 class StringBuilder {
 public:
+    StringBuilder() = default;
+    StringBuilder(StringBuilder&& other) noexcept
+        : memory_(std::move(other.memory_)),
+          size_(std::exchange(other.size_, 0)),
+          capacity_(std::exchange(other.capacity_, 0))
+    {
+    }
+    StringBuilder& operator=(StringBuilder other) noexcept
+    {
+        std::swap(memory_, other.memory_);
+        std::swap(size_, other.size_);
+        std::swap(capacity_, other.capacity_);
+        return *this;
+    }
+    ~StringBuilder() = default;
+
     void append(std::string_view text)
     {
         if (text.empty())
@@ -27,6 +44,7 @@ public:
 
     void append(char character) { append(std::string_view(&character, 1)); }
 
+    // Leaves an empty builder.
     [[nodiscard]] String finish() &&;
 
 private:

@@ -24,11 +24,6 @@ Value::Value(Dictionary dictionary) noexcept : kind_(Kind::Dictionary), object_(
 Value::Value(Data data) noexcept : kind_(Kind::Data), object_(data.bytes.object_.leak()) { }
 Value::Value(Date date) noexcept : kind_(Kind::Date), date_(date.secondsSince1970) { }
 
-bool Value::isShared() const noexcept
-{
-    return kind_ >= Kind::String && kind_ <= Kind::Data && object_ != nullptr;
-}
-
 template <typename Object> const Object* Value::objectAs() const noexcept
 {
     return static_cast<const Object*>(object_);
@@ -47,35 +42,12 @@ std::string_view Value::bytesUnchecked() const noexcept
     return object_ == nullptr ? std::string_view() : objectAs<StringObject>()->view();
 }
 
-Value::Value(const Value& other) noexcept : kind_(other.kind_), numberKind_(other.numberKind_), scalar_(other.scalar_)
+void Value::destroyObject() noexcept
 {
-    if (isShared())
-        object_->retain();
-}
-
-Value::Value(Value&& other) noexcept
-    : kind_(std::exchange(other.kind_, Kind::Null)),
-      numberKind_(other.numberKind_),
-      scalar_(std::exchange(other.scalar_, 0))
-{
-}
-
-Value& Value::operator=(Value other) noexcept
-{
-    std::swap(kind_, other.kind_);
-    std::swap(numberKind_, other.numberKind_);
-    std::swap(scalar_, other.scalar_);
-    return *this;
-}
-
-Value::~Value()
-{
-    if (!isShared() || !object_->release())
-        return;
     switch (kind_) {
-    case Kind::Array: ArrayObject::destroy(objectAs<ArrayObject>()); break;
-    case Kind::Dictionary: DictionaryObject::destroy(objectAs<DictionaryObject>()); break;
-    default: StringObject::destroy(objectAs<StringObject>()); break;
+    case Kind::Array: return ArrayObject::destroy(objectAs<ArrayObject>());
+    case Kind::Dictionary: return DictionaryObject::destroy(objectAs<DictionaryObject>());
+    default: return StringObject::destroy(objectAs<StringObject>());
     }
 }
 
@@ -256,12 +228,30 @@ const Value* DictionaryObject::find(std::string_view key) const noexcept
     return found == byKey_.end() || keyAt(*found) != key ? nullptr : &entries_[*found].value;
 }
 
+namespace {
+
+// Tells most keys apart without looking at all of their characters: a number below 64.
+unsigned fingerprint(std::string_view key) noexcept
+{
+    if (key.empty())
+        return 0;
+    const auto at = [key](std::size_t index) { return static_cast<std::uint8_t>(key[index]); };
+    return (static_cast<unsigned>(key.size()) + 5U * at(0) + 11U * at(key.size() / 2) + 23U * at(key.size() - 1)) % 64;
+}
+
+} // namespace
+
+// Nearly always nothing is repeated, and the fingerprints show it.
 void DictionaryObject::foldRepetitions()
 {
+    std::uint64_t seen = 0;
     auto kept = entries_.begin();
     for (auto entry = entries_.begin(); entry != entries_.end(); ++entry) {
-        const auto earlier =
-            std::find_if(entries_.begin(), kept, [&](const auto& other) { return other.key == entry->key; });
+        const std::uint64_t bit = std::uint64_t{1} << fingerprint(entry->key);
+        const auto earlier = (seen & bit) == 0
+            ? kept
+            : std::find_if(entries_.begin(), kept, [&](const auto& other) { return other.key == entry->key; });
+        seen |= bit;
         if (earlier != kept)
             earlier->value = std::move(entry->value);
         else if (kept++ != entry)

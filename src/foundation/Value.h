@@ -53,10 +53,29 @@ public:
     Value(Data data) noexcept;
     Value(Date date) noexcept;
 
-    Value(const Value& other) noexcept;
-    Value(Value&& other) noexcept;
-    Value& operator=(Value other) noexcept;
-    ~Value();
+    Value(const Value& other) noexcept : kind_(other.kind_), numberKind_(other.numberKind_), scalar_(other.scalar_)
+    {
+        if (isShared())
+            object_->retain();
+    }
+    Value(Value&& other) noexcept
+        : kind_(std::exchange(other.kind_, Kind::Null)),
+          numberKind_(other.numberKind_),
+          scalar_(std::exchange(other.scalar_, 0))
+    {
+    }
+    Value& operator=(Value other) noexcept
+    {
+        std::swap(kind_, other.kind_);
+        std::swap(numberKind_, other.numberKind_);
+        std::swap(scalar_, other.scalar_);
+        return *this;
+    }
+    ~Value()
+    {
+        if (isShared() && object_->release())
+            destroyObject();
+    }
 
     [[nodiscard]] Kind kind() const noexcept { return kind_; }
     [[nodiscard]] bool isNull() const noexcept { return kind_ == Kind::Null; }
@@ -91,7 +110,11 @@ public:
     friend bool operator==(const Value& left, const Value& right) noexcept;
 
 private:
-    [[nodiscard]] bool isShared() const noexcept;
+    [[nodiscard]] bool isShared() const noexcept
+    {
+        return kind_ >= Kind::String && kind_ <= Kind::Data && object_ != nullptr;
+    }
+    void destroyObject() noexcept;
     [[nodiscard]] Number numberUnchecked() const noexcept { return {numberKind_, scalar_}; }
     [[nodiscard]] std::string_view bytesUnchecked() const noexcept;
     template <typename Object> [[nodiscard]] const Object* objectAs() const noexcept;

@@ -13,10 +13,9 @@ void KestoReportingSession::sendMessage(const std::optional<foundation::Dictiona
                                         const KestoReportingReply& reply)
 {
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending message for session owned by {}", reporterID_);
-    const auto named = KestoReportingUtilityRemoveWhiteSpaceFromKeys(message.value_or(foundation::Dictionary()));
-    const auto tagged = KestoReportingUtilityAddAudioMessageTag(named, category, type);
-    const auto normalised = KestoReportingUtilityRemoveEventEpochTime(tagged);
-    createMessageIdentifier(category, type, normalised);
+    createMessageIdentifier(
+        category, type,
+        KestoReportingUtilityNormaliseMessage(message.value_or(foundation::Dictionary()), category, type));
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionMessageAccepted);
     if (reply)
         reply(std::nullopt);

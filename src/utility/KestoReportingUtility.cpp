@@ -74,13 +74,37 @@ foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Diction
     return name == nullptr ? unknown : *name;
 }
 
-foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation::Dictionary& message,
-                                                               AudioEventCategory category, AudioEventType type)
+namespace {
+
+foundation::DictionaryEntry audioMessageTag(AudioEventCategory category, AudioEventType type)
 {
     static const foundation::String tagKey("audiotag");
     std::string tag = KestoReportingUtilityCategoryString(category);
     tag += KestoReportingUtilityTypeString(type);
-    return message.with(tagKey, tag);
+    return {tagKey, tag};
+}
+
+bool hasBlank(const foundation::String& key)
+{
+    return key.view().contains(' ');
+}
+
+foundation::String withoutBlanks(const foundation::String& key)
+{
+    if (!hasBlank(key))
+        return key;
+    std::string changed(key.view());
+    std::ranges::replace(changed, ' ', '_');
+    return {changed};
+}
+
+} // namespace
+
+foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation::Dictionary& message,
+                                                               AudioEventCategory category, AudioEventType type)
+{
+    auto [key, tag] = audioMessageTag(category, type);
+    return message.with(std::move(key), std::move(tag));
 }
 
 foundation::Dictionary KestoReportingUtilityRemoveEventEpochTime(const foundation::Dictionary& message)
@@ -90,15 +114,25 @@ foundation::Dictionary KestoReportingUtilityRemoveEventEpochTime(const foundatio
 
 foundation::Dictionary KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message)
 {
-    const auto hasBlank = [](const foundation::DictionaryEntry& entry) { return entry.key.view().contains(' '); };
-    if (std::ranges::none_of(message, hasBlank))
+    if (std::ranges::none_of(message, hasBlank, &foundation::DictionaryEntry::key))
         return message;
-    foundation::Dictionary::Entries entries(message.begin(), message.end());
-    for (auto& entry : entries) {
-        std::string key(entry.key.view());
-        std::ranges::replace(key, ' ', '_');
-        entry.key = foundation::String(key);
-    }
+    foundation::Dictionary::Entries entries;
+    entries.reserve(message.size());
+    for (const auto& [key, value] : message)
+        entries.push_back({withoutBlanks(key), value});
+    return entries;
+}
+
+foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::Dictionary& message,
+                                                             AudioEventCategory category, AudioEventType type)
+{
+    const bool keepsTime = KestoReportingUtilityIsInternalBuild();
+    foundation::Dictionary::Entries entries;
+    entries.reserve(message.size() + 1);
+    for (const auto& [key, value] : message)
+        if (auto name = withoutBlanks(key); keepsTime || name != KestoReportingTimestampKey)
+            entries.push_back({std::move(name), value});
+    entries.push_back(audioMessageTag(category, type));
     return entries;
 }
 

@@ -57,6 +57,10 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 // The payload with "_" for every blank in its keys; of keys that become equal the last one's value stays.
 [[nodiscard]] foundation::Dictionary
 KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message);
+// These three one after the other, blanks first and the time stamp last, at the cost of one.
+[[nodiscard]] foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::Dictionary& message,
+                                                                           AudioEventCategory category,
+                                                                           AudioEventType type);
 
 // Rounded to that many decimal places, halves away from zero; negative places round to tens, hundreds...
 [[nodiscard]] double KestoReportingUtilityRoundWithPlaces(double value, int places);

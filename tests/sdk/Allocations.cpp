@@ -14,10 +14,15 @@ std::size_t sdk_test::allocations() noexcept
     return count;
 }
 
-void* operator new(std::size_t size)
+void* operator new(std::size_t size, const std::nothrow_t&) noexcept
 {
     ++count;
-    if (void* memory = std::malloc(size); memory != nullptr)
+    return std::malloc(size);
+}
+
+void* operator new(std::size_t size)
+{
+    if (void* memory = operator new(size, std::nothrow); memory != nullptr)
         return memory;
     throw std::bad_alloc();
 }

@@ -224,22 +224,23 @@ TEST_F(ClientTest, GivesWhatTheStateCallbackSaysAheadOfWhatWasSentBefore)
 {
     kesto::Options given = options();
     foundation::Mutex gate;
+    kesto::Client client; // ends before what its callback uses
     gate.lock();
     given.stateChanged = [&](const kesto::StateChange& change) {
         if (change.state != State::Connected)
             return;
         const foundation::Lock lock(gate);
-        client_.createSession(42);
-        client_.startSession(42);
+        client.createSession(42);
+        client.startSession(42);
         kesto::Message message;
-        client_.send(message.add("which", "first"), Category::Playback, EventType::Start, 42);
+        client.send(message.add("which", "first"), Category::Playback, EventType::Start, 42);
     };
     service_.emplace(path_);
-    ASSERT_EQ(client_.open(given), Status::Ok);
+    ASSERT_EQ(client.open(given), Status::Ok);
     kesto::Message message;
-    client_.send(message.add("which", "second"), Category::Playback, EventType::Start, 42);
+    client.send(message.add("which", "second"), Category::Playback, EventType::Start, 42);
     gate.unlock();
-    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client.flush(longEnough), Status::Ok);
     EXPECT_THAT(service_->waitForCalls(4),
                 ElementsAre(Array{1, 1, 42}, Array{2, 5, 42},
                             Array{3, 6, Dictionary{{"which", "first"}}, 4, 1, Array{42}},

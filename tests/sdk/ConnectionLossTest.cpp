@@ -88,7 +88,8 @@ TEST_F(ConnectionLossTest, HandsOutWhatWasAnsweredBeforeTheServiceWent)
     open(false);
     client_.createSession(42, answers_.named("create"));
     client_.createSession(43, answers_.named("second"));
-    EXPECT_THAT(answers_.waitFor(2).front(), "create");
+    ASSERT_GE(answers_.waitFor(1).size(), 1U);
+    EXPECT_EQ(answers_.entries().front(), "create");
 }
 
 TEST_F(ConnectionLossTest, TellsAFlushThatWaits)
@@ -96,7 +97,9 @@ TEST_F(ConnectionLossTest, TellsAFlushThatWaits)
     service_.emplace(path_, [](Peer& peer, const Array&) { peer.close(); });
     open(false);
     client_.createSession(42);
-    EXPECT_EQ(client_.flush(longEnough), Status::ConnectionLost);
+    EXPECT_THAT(client_.flush(longEnough),
+                testing::AnyOf(Status::ConnectionLost, // while it waited, or before
+                               Status::NotConnected));
 }
 
 TEST_F(ConnectionLossTest, AnswersWhatWaitedForAConnectionThatCouldNotBeMade)
@@ -113,14 +116,15 @@ TEST_F(ConnectionLossTest, AnswersWhatWaitedForAConnectionThatCouldNotBeMade)
         EXPECT_FALSE(change.willRetry);
         states_.add(change.state);
     };
-    ASSERT_EQ(client_.open(options), Status::Ok);
-    const Status taken = client_.createSession(42, answers_.named("create"));
+    kesto::Client client; // ends before what its callback uses
+    ASSERT_EQ(client.open(options), Status::Ok);
+    const Status taken = client.createSession(42, answers_.named("create"));
     gate.unlock();
     EXPECT_THAT(states_.waitFor(1), ElementsAre(State::Disconnected));
     if (taken == Status::Ok) { // else it had failed already
         EXPECT_THAT(answers_.waitFor(1), ElementsAre("create" + lost));
     }
-    EXPECT_EQ(client_.state(), State::Disconnected);
+    EXPECT_EQ(client.state(), State::Disconnected);
 }
 
 TEST_F(ConnectionLossTest, ConnectsAgainWhenTheServiceIsBackAndBeginsWithoutSessions)
@@ -132,24 +136,26 @@ TEST_F(ConnectionLossTest, ConnectsAgainWhenTheServiceIsBackAndBeginsWithoutSess
     options.firstRetry = std::chrono::milliseconds(1);
     options.longestRetry = std::chrono::milliseconds(20);
     sdk_test::Recorder<std::string> connected;
+    kesto::Client client; // ends before what its callback uses
     options.stateChanged = [&](const kesto::StateChange& change) {
         if (change.state != State::Connected)
             return;
-        client_.createSession(42);
-        client_.startSession(42, answers_.named("start"));
+        client.createSession(42);
+        client.startSession(42, answers_.named("start"));
         connected.add("connected");
     };
-    ASSERT_EQ(client_.open(options), Status::Ok);
+    ASSERT_EQ(client.open(options), Status::Ok);
     ASSERT_EQ(connected.waitFor(1).size(), 1U);
-    ASSERT_EQ(client_.flush(longEnough), Status::Ok);
+    ASSERT_EQ(client.flush(longEnough), Status::Ok);
     service_.reset();
     EXPECT_THAT(answers_.waitFor(1), ElementsAre("start" + lost));
     service_.emplace(path_);
     ASSERT_EQ(connected.waitFor(2).size(), 2U);
-    ASSERT_EQ(send(answers_.named("send")), Status::Ok);
-    client_.stopSession(42, answers_.named("stop"));
+    ASSERT_EQ(client.send(kesto::Message(), Category::Playback, EventType::Start, 42, answers_.named("send")),
+              Status::Ok);
+    client.stopSession(42, answers_.named("stop"));
     EXPECT_THAT(answers_.waitFor(4), ElementsAre("start" + lost, "send", "start", "stop"));
-    EXPECT_EQ(client_.statistics().connections, 2U);
+    EXPECT_EQ(client.statistics().connections, 2U);
 }
 
 TEST_F(ConnectionLossTest, GoesOnTryingUntilTheServiceIsThere)
@@ -180,7 +186,8 @@ TEST_F(ConnectionLossTest, DoublesThePauseBetweenAttemptsUpToTheLongest)
         if (change.state == State::Disconnected)
             pauses.add(change.retryAfter.count());
     };
-    ASSERT_EQ(client_.open(options), Status::Ok);
+    kesto::Client client; // ends before what its callback uses
+    ASSERT_EQ(client.open(options), Status::Ok);
     const auto first = pauses.waitFor(5);
     EXPECT_THAT(std::vector(first.begin(), first.begin() + 5), ElementsAre(1, 2, 4, 6, 6));
 }

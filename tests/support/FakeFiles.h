@@ -16,6 +16,7 @@ public:
     std::map<std::filesystem::path, unsigned> directories; // with their permissions
     std::map<std::filesystem::path, std::string> files;
     std::error_code directoryError; // of the next attempts, unless it is none
+    std::error_code createError;
     std::error_code writeError;
 
     [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return "/diagnostics"; }
@@ -30,6 +31,8 @@ public:
     std::expected<std::unique_ptr<platform::AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) override
     {
+        if (createError)
+            return std::unexpected(createError);
         return std::make_unique<File>(*this, path);
     }
 

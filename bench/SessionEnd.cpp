@@ -1,0 +1,190 @@
+// What the end of a long session costs: finding what was played, the file, the summary event, and the memory that all
+// of it takes.
+#include "ChildProcess.h"
+#include "Groups.h"
+#include "InProcessPlatform.h"
+#include "SampleMessage.h"
+#include "foundation/Json.h"
+#include "platform/linux/LinuxFileSystem.h"
+#include "session/KestoReportingSession.h"
+
+#include <cstdio>
+#include <fmt/format.h>
+#include <fstream>
+#include <malloc.h>
+#include <memory>
+#include <rapidjson/document.h>
+#include <rapidjson/filewritestream.h>
+#include <rapidjson/prettywriter.h>
+
+namespace bench {
+namespace {
+
+constexpr std::uint32_t messageCount = 1'000'000;
+
+// A player that runs for days: it says something eight times a second, is paused now and then, and its volume is
+// changed while it plays. As many entries as the sample message has; spatial audio is rarely switched.
+foundation::Dictionary playerMessage(std::uint32_t number)
+{
+    constexpr std::uint32_t pause = 2000;
+    constexpr std::uint32_t volume = 500;
+    constexpr std::uint32_t spatialSwitch = 100;
+    const auto switched = number % spatialSwitch == 0 ? foundation::Dictionary{{"spatializationEnabled", false}}
+                                                      : foundation::Dictionary{{"route_change_reason", 3}};
+    return sampleMessage(numberMark + number)
+        .without("spatializationEnabled")
+        .mergedWith({{"kestoreporting_timestamp", 1'767'225'600.25 + number * 0.128371},
+                     {"systemuptime_sec", 86'523 + number / 8},
+                     {"session_output_running", number % pause >= pause / 10},
+                     {"PomoSessionVolume", 0.25 + 0.0625 * (number / volume % 8)}})
+        .mergedWith(switched);
+}
+
+template <typename Send> void sendMessages(Send send)
+{
+    for (std::uint32_t number = 1; number <= messageCount; ++number)
+        send(playerMessage(number));
+}
+
+std::shared_ptr<KestoReportingSession> makeLongSession()
+{
+    auto session = std::make_shared<KestoReportingSession>(sampleReporterID, std::vector<std::int32_t>{1});
+    session->start();
+    sendMessages([&](const auto& message) { session->sendMessage(message, sampleCategory, sampleType, nullptr); });
+    return session;
+}
+
+std::size_t textSize(const foundation::Dictionary& summary)
+{
+    std::size_t size = 0;
+    for (const auto& [key, value] : summary)
+        size += value.stringView().size();
+    return size;
+}
+
+template <typename Work> Contestant millisecondsOf(Work work)
+{
+    return [work] {
+        const auto start = Clock::now();
+        work();
+        return nanosecondsSince(start) / 1e6;
+    };
+}
+
+void measureAnalysis(const Options& options, Report& report)
+{
+    KestoReportingMessageStore store(KestoReportingStorageBudget::service());
+    sendMessages([&](const auto& message) { use(store.record(sampleCategory, sampleType, message)); });
+    const std::optional<foundation::Value> process("player");
+    const auto times =
+        compete(options, "combining and volume analysis",
+                millisecondsOf([&] { use(KestoReportingSession::createVolumeMessages(store, process, 0.5)); }));
+    std::vector<double> each;
+    for (const double milliseconds : times[0].figures())
+        each.push_back(milliseconds * 1e6 / messageCount);
+    report.add({fmt::format("combining and volume analysis, each of {} messages", messageCount),
+                "ns",
+                each,
+                {},
+                Target::figureAtMost(200)});
+}
+
+// The same data in RapidJSON's own form.
+void parseMessages(const KestoReportingSession& session, rapidjson::Document& document)
+{
+    std::string text = "[";
+    for (const auto& message : session.nestedAggregatedPayloadData().value()) {
+        text += text.size() == 1 ? "" : ",";
+        if (!foundation::appendJson(message, text))
+            throw std::runtime_error("a message cannot be written as JSON");
+    }
+    text += ']';
+    document.Parse<rapidjson::kParseFullPrecisionFlag>(text.data(), text.size());
+}
+
+void writeWithRapidJson(const rapidjson::Document& document, const std::filesystem::path& path)
+{
+    const std::unique_ptr<std::FILE, int (*)(std::FILE*)> file(std::fopen(path.c_str(), "w"), std::fclose);
+    std::vector<char> buffer(std::size_t{64} << 10);
+    rapidjson::FileWriteStream stream(file.get(), buffer.data(), buffer.size());
+    rapidjson::PrettyWriter<rapidjson::FileWriteStream> writer(stream);
+    document.Accept(writer);
+}
+
+void measureFile(const Options& options, Report& report, const KestoReportingSession& session,
+                 const std::filesystem::path& directory)
+{
+    rapidjson::Document document;
+    parseMessages(session, document);
+    const auto times = compete(options, "summary file", millisecondsOf([&] { session.writeSummaryJson(); }),
+                               millisecondsOf([&] { writeWithRapidJson(document, directory / "rapidjson.json"); }));
+    report.add({fmt::format("summary file of {} messages", messageCount), "ms", times[0],
+                Peer{"RapidJSON's pretty writer", times[1]}, Target::ratioAtMost(1.3)});
+}
+
+void measureEvent(const Options& options, Report& report, const KestoReportingSession& session)
+{
+    const foundation::Dictionary summary = session.createSummaryEventForSession().value();
+    const auto copyText = [&summary] {
+        std::string copy;
+        copy.reserve(textSize(summary));
+        for (const auto& [key, value] : summary)
+            copy += value.stringView();
+        use(copy);
+    };
+    const auto times =
+        compete(options, "summary event", millisecondsOf([&] { use(session.createSummaryEventForSession()); }),
+                millisecondsOf(copyText));
+    report.add({fmt::format("summary event of {} messages", messageCount), "ms", times[0],
+                Peer{"copy of its text", times[1]}, Target::ratioAtMost(3)});
+}
+
+// Of this process, in megabytes: "VmRSS", or "VmHWM" for the most since `forgetMostMemory`.
+double memory(std::string_view what)
+{
+    std::ifstream status("/proc/self/status");
+    for (std::string line; std::getline(status, line);)
+        if (line.starts_with(what))
+            return std::stod(line.substr(what.size() + 1)) / 1024;
+    return 0;
+}
+
+void forgetMostMemory()
+{
+    std::ofstream("/proc/self/clear_refs") << "5";
+}
+
+void measureMemory(const Options& options, Report& report)
+{
+    std::vector<double> more;
+    std::vector<double> texts;
+    for (int round = 0; round < options.rounds; ++round) {
+        showProgress(fmt::format("memory of a session's end: round {} of {}", round + 1, options.rounds));
+        const auto session = makeLongSession();
+        texts.push_back(static_cast<double>(textSize(session->createSummaryEventForSession().value())) / (1 << 20));
+        ::malloc_trim(0);
+        const double before = memory("VmRSS");
+        forgetMostMemory();
+        session->stop();
+        more.push_back(memory("VmHWM") - before);
+    }
+    clearProgress();
+    report.add({"memory while it ends, over before", "MB", more, Peer{"text of the summary event", texts},
+                Target::ratioAtMost(1.5)});
+}
+
+} // namespace
+
+void measureSessionEnd(const Options& options, Report& report)
+{
+    const TemporaryDirectory directory;
+    platform::LinuxFileSystem files(directory.path());
+    const InProcessPlatform platform(&files);
+    measureMemory(options, report);
+    measureAnalysis(options, report);
+    const auto session = makeLongSession();
+    measureFile(options, report, *session, directory.path());
+    measureEvent(options, report, *session);
+}
+
+} // namespace bench

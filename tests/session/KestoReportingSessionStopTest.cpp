@@ -1,0 +1,259 @@
+// The end of a run, step by step: volume events, file, summary event.
+#include "session/KestoReportingSession.h"
+#include "session/StoredMessages.h"
+#include "support/TestPlatform.h"
+
+#include <gmock/gmock.h>
+
+namespace {
+
+using enum platform::LogLevel;
+using foundation::Dictionary;
+using foundation::Value;
+using support::IsLine;
+using testing::Contains;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::Not;
+using testing::SizeIs;
+
+constexpr AudioEventCategory playback = 4;
+constexpr std::uint32_t stopping = 0x21044830;
+constexpr std::uint32_t accepted = 0x21044838;
+
+class SessionStop : public testing::Test {
+protected:
+    explicit SessionStop(bool isInternal = true)
+    {
+        platform.deviceProperties.setInternalBuild(isInternal);
+        platform.analytics.use("*");
+        session->setServiceType(7);
+        session->setConfiguration(Dictionary{{"HostApplicationDisplayID", "org.player"}});
+        session->start();
+    }
+
+    void send(double time, const Dictionary& message)
+    {
+        session->sendMessage(message.with("kestoreporting_timestamp", time), playback, 1, nullptr);
+    }
+    // Plays 30 seconds at one volume and 70 at another.
+    void play()
+    {
+        send(0, {{"session_output_running", true}, {"PomoSessionVolume", 0.5}});
+        send(30, {{"PomoSessionVolume", 0.75}});
+        send(100, {{"session_output_running", false}});
+    }
+    // The identifiers of what the session holds.
+    [[nodiscard]] std::vector<std::string> identifiers() const
+    {
+        std::vector<std::string> identifiers;
+        for (const Dictionary& message : session->nestedAggregatedPayloadData().value_or(Messages()))
+            identifiers.emplace_back(message.begin()->key.view());
+        return identifiers;
+    }
+    // Stops, and remembers what happened where it can be seen from outside.
+    std::vector<std::string> stop()
+    {
+        std::vector<std::string> steps;
+        platform.log.setObserver([&](const support::LogLine& line) {
+            if (line.level != Debug)
+                steps.push_back(line.message);
+        });
+        platform.analytics.setObserver(
+            [&](const std::string& name) { steps.push_back(name + " after " + identifiers().back()); });
+        platform.traceMarkers.setObserver([&](std::uint32_t code) {
+            if (code == accepted)
+                steps.push_back("recorded " + identifiers().back());
+        });
+        session->stop();
+        platform.log.setObserver(nullptr);
+        platform.analytics.setObserver(nullptr);
+        platform.traceMarkers.setObserver(nullptr);
+        return steps;
+    }
+
+    support::TestPlatform platform;
+    std::shared_ptr<KestoReportingSession> session =
+        std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
+};
+
+class CustomerSessionStop : public SessionStop {
+protected:
+    CustomerSessionStop() : SessionStop(false) { }
+};
+
+TEST_F(SessionStop, RecordsEachVolumeEventThenHandsItToTheBridgeThenWritesTheFileThenRecordsTheSummary)
+{
+    play();
+    const auto steps = stop();
+    ASSERT_THAT(steps, SizeIs(10));
+    EXPECT_THAT(steps[7], HasSubstr("jsonOutput writeToURL: /diagnostics/Audio/Reporting/"));
+    auto others = steps;
+    others.erase(others.begin() + 7);
+    EXPECT_THAT(others,
+                ElementsAre("sending volume event for reporter 42", "recorded Volume_Summary_1",
+                            "com.quarn.kesto.Volume.Summary after Volume_Summary_1",
+                            "com.quarn.longformaudio.Volume.Summary after Volume_Summary_1",
+                            "recorded Volume_Summary_2", "com.quarn.kesto.Volume.Summary after Volume_Summary_2",
+                            "com.quarn.longformaudio.Volume.Summary after Volume_Summary_2",
+                            "sending summary event for reporter 42", "recorded Undefined_Unknown_1"));
+}
+
+TEST_F(SessionStop, SaysWhatItDoesAtItsLevel)
+{
+    play();
+    platform.log.clear();
+    session->stop();
+    const auto lines = platform.log.lines("kerr");
+    const auto sending = IsLine(Debug, "kerr", "sending message for session owned by 42");
+    ASSERT_THAT(lines, SizeIs(8));
+    EXPECT_THAT(lines[0], IsLine(Debug, "kerr", "ending session 42"));
+    EXPECT_THAT(lines[1], IsLine(Debug, "kerr", "ending session 42"));
+    EXPECT_THAT(lines[2], IsLine(Default, "kerr", "sending volume event for reporter 42"));
+    EXPECT_THAT(lines[3], sending);
+    EXPECT_THAT(lines[4], sending);
+    EXPECT_EQ(lines[5].level, Info);
+    EXPECT_THAT(lines[6], IsLine(Default, "kerr", "sending summary event for reporter 42"));
+    EXPECT_THAT(lines[7], sending);
+    EXPECT_THAT(platform.log.lines("keri"), SizeIs(4));
+    for (const auto& line : platform.log.lines())
+        EXPECT_EQ(line.file, "KestoReportingSession");
+}
+
+TEST_F(SessionStop, MarksItsMomentsForTheKernelTrace)
+{
+    play();
+    platform.traceMarkers.take();
+    session->stop();
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(stopping, accepted, accepted, accepted));
+}
+
+TEST_F(SessionStop, HandsVolumeEventsToTheBridgeAsTheyWereMade)
+{
+    play();
+    session->stop();
+    const auto events = platform.analytics.payloads("com.quarn.kesto.Volume.Summary");
+    ASSERT_THAT(events, SizeIs(2));
+    EXPECT_EQ(Value(events[1]).text(),
+              R"({"session_selected_format":"unknown","active_devices":"unknown",)"
+              R"("HostApplicationDisplayID":"org.player","PomoSessionVolume":0.75,"PomoSessionVolumeBucketed":"0.75",)"
+              R"("play_seconds":70,"spatial-audio-accessory-feature":false,"spatializationEnabled":false,)"
+              R"("ringerstate":false,"mChannelsPerFrame":-1,"play_secondsBucketed":"60","msgidx":2,"msgcnt":2})");
+    EXPECT_EQ(platform.analytics.payloads("com.quarn.longformaudio.Volume.Summary"), events);
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(4)) << "and the bridge hears of nothing else";
+}
+
+TEST_F(SessionStop, PutsVolumeEventsIntoTheFileButNotTheSummary)
+{
+    play();
+    session->stop();
+    ASSERT_THAT(platform.fileSystem.files, SizeIs(1));
+    const std::string& text = platform.fileSystem.files.begin()->second;
+    EXPECT_THAT(text, HasSubstr("\"Volume_Summary_2\": {"));
+    EXPECT_THAT(text, HasSubstr("\"audiotag\": \"VolumeSummary\""));
+    EXPECT_THAT(text, Not(HasSubstr("KESTO_Session_Summary_Event")));
+}
+
+TEST_F(SessionStop, PutsVolumeEventsIntoTheSummaryUnderItsOwnTag)
+{
+    play();
+    Dictionary summary;
+    platform.traceMarkers.setObserver(
+        [&](std::uint32_t) { summary = *session->nestedAggregatedPayloadData()->back().begin()->value.dictionary(); });
+    session->stop();
+    EXPECT_EQ(summary.find("play_seconds")->text(), "30,70");
+    EXPECT_EQ(summary.find("PomoSessionVolume")->text(), "0.5,0.75,0.5,0.75");
+    EXPECT_EQ(summary.find("KESTO_Session_Summary_Event")->text(), "7");
+    EXPECT_EQ(summary.find("audiotag")->text(), "UndefinedUnknown");
+    platform.traceMarkers.setObserver(nullptr);
+}
+
+TEST_F(SessionStop, RecordsNoVolumeEventThatRepeatsTheOneBeforeButHandsItToTheBridge)
+{
+    play();
+    const Dictionary asTheFirstWillBe{{"session_selected_format", "unknown"},
+                                      {"active_devices", "unknown"},
+                                      {"HostApplicationDisplayID", "org.player"},
+                                      {"PomoSessionVolume", 0.5},
+                                      {"PomoSessionVolumeBucketed", "0.5"},
+                                      {"play_seconds", 30},
+                                      {"spatial-audio-accessory-feature", false},
+                                      {"spatializationEnabled", false},
+                                      {"ringerstate", false},
+                                      {"mChannelsPerFrame", -1},
+                                      {"play_secondsBucketed", "30"},
+                                      {"msgidx", 1},
+                                      {"msgcnt", 2}};
+    session->sendMessage(asTheFirstWillBe.with("kestoreporting_timestamp", 100), 14, 11, nullptr);
+    platform.log.clear();
+    session->stop();
+    EXPECT_THAT(platform.log.lines(), Contains(IsLine(Debug, "kerr", "dropping redundant event")).Times(1));
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Volume.Summary"), SizeIs(2));
+}
+
+TEST_F(SessionStop, SendsNoVolumeEventWithoutAnApplication)
+{
+    session->setConfiguration(Dictionary{{"HostApplicationDisplayID", Value()}});
+    play();
+    const auto steps = stop();
+    EXPECT_THAT(steps,
+                ElementsAre(HasSubstr("jsonOutput writeToURL: "), "sending summary event for reporter 42",
+                            "recorded Undefined_Unknown_1"));
+}
+
+TEST_F(SessionStop, NamesAnApplicationThatItDoesNotKnowUnknown)
+{
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
+    session->start();
+    play();
+    session->stop();
+    EXPECT_EQ(*platform.analytics.payloads("com.quarn.kesto.Volume.Summary").at(0).find("HostApplicationDisplayID"),
+              Value("Unknown"));
+}
+
+TEST_F(SessionStop, SaysAndSendsNothingWhenNothingWasRecorded)
+{
+    EXPECT_THAT(stop(), IsEmpty());
+    EXPECT_THAT(platform.analytics.sent(), IsEmpty());
+    EXPECT_THAT(platform.fileSystem.files, IsEmpty());
+}
+
+TEST_F(SessionStop, CountsAnewInTheNextRun)
+{
+    play();
+    session->stop();
+    session->start();
+    play();
+    const auto steps = stop();
+    EXPECT_THAT(steps, Contains("recorded Volume_Summary_2"));
+    EXPECT_THAT(steps, Contains("recorded Undefined_Unknown_1"));
+}
+
+TEST_F(SessionStop, HandsVolumeEventsToTheBridgeEvenWhenThereIsNoMemoryToRecordThem)
+{
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(1024);
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
+    session->start();
+    play();
+    for (int message = 0; message < 100; ++message)
+        send(100, {{"a", message}});
+    platform.log.clear();
+    session->stop();
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Volume.Summary"), SizeIs(2));
+    EXPECT_THAT(platform.log.lines(), Contains(IsLine(Default, "kerr", "sending summary event for reporter 42")));
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
+TEST_F(CustomerSessionStop, MeasuresNothingAndWritesNoFileButRecordsTheSummary)
+{
+    play();
+    EXPECT_THAT(stop(), ElementsAre("sending summary event for reporter 42", "recorded Undefined_Unknown_1"));
+    EXPECT_THAT(platform.analytics.sent(), IsEmpty());
+    EXPECT_THAT(platform.fileSystem.files, IsEmpty());
+    const std::string skipped = "skipped volume message, too short { func=+[KestoReportingSession "
+                                "createVolumeMessages:process:minimumPlaytime:], action=skip, count=0 }";
+    EXPECT_THAT(platform.log.lines("keri"), Contains(IsLine(Debug, "keri", skipped)).Times(2));
+}
+
+} // namespace

@@ -1,0 +1,56 @@
+// Message stores made from plain payloads, and what they hold as plain dictionaries.
+#pragma once
+
+#include "session/KestoReportingMessageStore.h"
+
+#include <gtest/gtest.h>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace foundation {
+
+// How failures show dictionaries.
+inline void PrintTo(const Dictionary& dictionary, std::ostream* out)
+{
+    *out << Value(dictionary).text();
+}
+inline void showValue(const Dictionary& dictionary, std::ostream& out)
+{
+    out << Value(dictionary).text();
+}
+
+} // namespace foundation
+
+using Messages = std::vector<foundation::Dictionary>;
+
+// A store of these payloads, all of them: as errors, of which none is dropped for being repeated.
+inline std::unique_ptr<KestoReportingMessageStore> storeOf(const Messages& payloads)
+{
+    auto store = std::make_unique<KestoReportingMessageStore>(
+        std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 30));
+    for (const auto& payload : payloads)
+        EXPECT_EQ(store->record(AudioEventCategoryError, 1, payload), KestoReportingMessageStore::Outcome::Recorded);
+    return store;
+}
+
+// Identifier to payload, one entry each.
+inline Messages messagesOf(const KestoReportingMessageStore& store)
+{
+    Messages messages;
+    store.forEach([&](const KestoReportingMessageStore::Message& message) {
+        messages.push_back({{foundation::String(store.identifier(message)), message.payload.dictionary()}});
+    });
+    return messages;
+}
+
+// What tells everything apart: order of entries, kinds of numbers, and values that equal nothing.
+inline std::vector<std::string> textsOf(const Messages& dictionaries)
+{
+    std::vector<std::string> texts;
+    for (const auto& dictionary : dictionaries)
+        texts.push_back(foundation::Value(dictionary).text());
+    return texts;
+}
