@@ -139,8 +139,7 @@ TEST_F(FileSystem, SaysWhyAFolderCannotBeMade)
               std::errc::no_such_file_or_directory);
     ASSERT_EQ(::chmod(root.c_str(), 0555), 0);
     EXPECT_TRUE(inChild([&] {
-        return becomeNobody()
-            && files.createDirectories(root / "Audio", 0777).error() == std::errc::permission_denied;
+        return becomeNobody() && files.createDirectories(root / "Audio", 0777).error() == std::errc::permission_denied;
     }));
     ASSERT_EQ(::chmod(root.c_str(), 0700), 0);
 }
@@ -148,8 +147,8 @@ TEST_F(FileSystem, SaysWhyAFolderCannotBeMade)
 TEST_F(FileSystem, KeepsBelowItsRoot)
 {
     const fs::path outside = root.parent_path() / "kesto-test-outside";
-    for (const fs::path& path : {outside, root / "..", root / "../kesto-test-outside", root / "a/../../x", fs::path("relative"),
-                                 fs::path(), fs::path("/")}) {
+    for (const fs::path& path : {outside, root / "..", root / "../kesto-test-outside", root / "a/../../x",
+                                 fs::path("relative"), fs::path(), fs::path("/")}) {
         EXPECT_EQ(files.createDirectories(path, 0777).error(), std::errc::invalid_argument) << path;
         EXPECT_EQ(write(path / "file", "text").error(), std::errc::invalid_argument) << path;
     }
