@@ -54,7 +54,8 @@ private:
     // False when the key is new. Keys come in the same order in nearly every message: the next one is tried first.
     bool moveTo(std::string_view key)
     {
-        if (++position_ < values_.size() && values_[position_].key == key)
+        ++position_;
+        if (position_ < values_.size() && values_[position_].key == key)
             return true;
         const auto [found, isNew] = positions_.try_emplace(std::string(key), values_.size());
         if (isNew)
