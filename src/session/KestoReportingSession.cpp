@@ -130,5 +130,5 @@ void KestoReportingSession::sendSummaryEvent()
     if (!summary)
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Default, "sending summary event for reporter {}", reporterID_);
-    sendMessage(*summary, AudioEventCategoryUndefined, AudioEventTypeUnknown, true, nullptr);
+    sendMessage(summary, AudioEventCategoryUndefined, AudioEventTypeUnknown, true, nullptr);
 }
