@@ -1,3 +1,4 @@
+// What is too much for a header: sizes of containers, and values that have to be built.
 #include "foundation/CborView.h"
 
 #include "foundation/Cbor.h"

@@ -1,3 +1,4 @@
+// The compact form, in one piece.
 #include "foundation/Json.h"
 
 #include "foundation/JsonValueWriter.h"

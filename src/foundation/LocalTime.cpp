@@ -1,3 +1,4 @@
+// The time zone is read anew each time: a device travels while the service runs.
 #include "foundation/LocalTime.h"
 
 #include "foundation/Number.h"

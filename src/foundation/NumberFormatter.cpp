@@ -1,3 +1,4 @@
+// The standard library rounds the exact binary value half to even; what is left to do is to drop zeros.
 #include "foundation/NumberFormatter.h"
 
 #include <algorithm>

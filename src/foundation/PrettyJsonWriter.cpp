@@ -1,3 +1,4 @@
+// RapidJSON indents; the text gathers here and is passed on in large pieces.
 #include "foundation/PrettyJsonWriter.h"
 
 #include "foundation/JsonValueWriter.h"

@@ -1,3 +1,4 @@
+// Memory doubles while the string grows, and is cut to size when it is finished.
 #include "foundation/StringBuilder.h"
 
 #include <algorithm>
