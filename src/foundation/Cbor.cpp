@@ -236,33 +236,37 @@ private:
         return bytes.empty() ? 0 : cborBigEndian<Integer>(bytes.data());
     }
 
-    std::uint64_t readArgument(std::uint8_t additional) noexcept
-    {
-        switch (additional) {
-        case 24: return takeBigEndian<std::uint8_t>();
-        case 25: return takeBigEndian<std::uint16_t>();
-        case 26: return takeBigEndian<std::uint32_t>();
-        case 27: return takeBigEndian<std::uint64_t>();
-        case Head::indefiniteLength: return 0;
-        default: break;
-        }
-        if (additional >= 24)
-            fail(CborError::Malformed);
-        return additional;
-    }
-
     Head readHead() noexcept
     {
-        const std::string_view initial = take(1);
-        if (initial.empty())
+        if (rest_.empty()) {
+            fail(CborError::Truncated);
             return {};
-        const auto byte = static_cast<std::uint8_t>(initial.front());
-        Head head{static_cast<Major>(byte >> 5), static_cast<std::uint8_t>(byte & 0x1F), 0};
+        }
+        const auto byte = static_cast<std::uint8_t>(rest_.front());
+        rest_.remove_prefix(1);
+        Head head{static_cast<Major>(byte >> 5), static_cast<std::uint8_t>(byte & 0x1F), byte & 0x1FU};
+        if (head.additional >= 24) // the number stands behind
+            readArgument(head);
+        return head;
+    }
+
+    void readArgument(Head& head) noexcept
+    {
         const bool mayBeIndefinite = head.major >= Major::Bytes && head.major <= Major::Map;
-        if (head.isIndefinite() && !mayBeIndefinite)
-            fail(CborError::Malformed);
-        head.argument = readArgument(head.additional);
-        return error_ ? Head() : head;
+        switch (head.additional) {
+        case 24: head.argument = takeBigEndian<std::uint8_t>(); break;
+        case 25: head.argument = takeBigEndian<std::uint16_t>(); break;
+        case 26: head.argument = takeBigEndian<std::uint32_t>(); break;
+        case 27: head.argument = takeBigEndian<std::uint64_t>(); break;
+        case Head::indefiniteLength:
+            head.argument = 0;
+            if (mayBeIndefinite)
+                break;
+            [[fallthrough]];
+        default: fail(CborError::Malformed);
+        }
+        if (error_)
+            head = Head();
     }
 
     Value readItem(unsigned depth)

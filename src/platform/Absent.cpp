@@ -1,17 +1,7 @@
+// None of them does anything, but each answers whoever waits for an answer.
 #include "platform/Absent.h"
 
 namespace platform {
-
-Notifications::Registration AbsentNotifications::registerNotification(std::string_view, std::shared_ptr<WorkQueue>,
-                                                                      Handler)
-{
-    return {.status = unavailable, .token = 0};
-}
-
-std::expected<std::uint64_t, NotificationStatus> AbsentNotifications::state(std::int32_t) const
-{
-    return std::unexpected(unavailable);
-}
 
 void AbsentTraceMarkers::emit(std::uint32_t, const std::array<std::uint64_t, 4>&) { }
 

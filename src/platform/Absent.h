@@ -4,23 +4,11 @@
 
 #include "platform/BugCapture.h"
 #include "platform/KernelTrace.h"
-#include "platform/Notifications.h"
 #include "platform/PerformanceWriter.h"
 #include "platform/ReportingChannels.h"
 #include "platform/TraceMarkers.h"
 
 namespace platform {
-
-// Nothing can be registered, and no state can be read.
-class AbsentNotifications final : public Notifications {
-public:
-    Registration registerNotification(std::string_view name, std::shared_ptr<WorkQueue> queue,
-                                      Handler handler) override;
-    [[nodiscard]] std::expected<std::uint64_t, NotificationStatus> state(std::int32_t token) const override;
-
-private:
-    static constexpr NotificationStatus unavailable = 1;
-};
 
 // Markers go nowhere.
 class AbsentTraceMarkers final : public TraceMarkers {

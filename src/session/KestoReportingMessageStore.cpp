@@ -76,9 +76,17 @@ bool KestoReportingMessageStore::repeatsLast(const Kind& kind, const foundation:
     return payload.isEqualIgnoring(kind.isLastDecoded ? kind.lastDecoded : kind.last.dictionary(), timeStampKeys);
 }
 
+// Messages come in runs of one kind, which is told by its numbers.
 std::uint32_t KestoReportingMessageStore::kindOf(AudioEventCategory category, AudioEventType type)
 {
-    // By name, not by number: numbers that share their names are one kind.
+    if (!recent_ || recent_->category != category || recent_->type != type)
+        recent_ = {category, type, kindNamedLike(category, type)};
+    return recent_->kind;
+}
+
+// Numbers that share their names are one kind.
+std::uint32_t KestoReportingMessageStore::kindNamedLike(AudioEventCategory category, AudioEventType type)
+{
     std::string key = KestoReportingUtilityCategoryString(category);
     key += '_';
     key += KestoReportingUtilityTypeString(type);

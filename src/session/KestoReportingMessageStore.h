@@ -15,6 +15,7 @@
 #include <cstring>
 #include <deque>
 #include <memory>
+#include <optional>
 #include <string>
 #include <string_view>
 #include <unordered_map>
@@ -113,12 +114,19 @@ private:
         foundation::Dictionary lastDecoded; // while `isLastDecoded`
         bool isLastDecoded = false;
     };
+    struct Recent {
+        AudioEventCategory category;
+        AudioEventType type;
+        std::uint32_t kind;
+    };
     struct Chunk {
         std::unique_ptr<char[]> bytes;
         std::size_t used = 0;
         std::size_t capacity = 0;
     };
+
     std::uint32_t kindOf(AudioEventCategory category, AudioEventType type);
+    std::uint32_t kindNamedLike(AudioEventCategory category, AudioEventType type);
     [[nodiscard]] static bool repeatsLast(const Kind& kind, const foundation::Dictionary& payload);
     [[nodiscard]] bool append(std::uint32_t kind, const foundation::Dictionary& payload, Payload& appended);
     [[nodiscard]] bool pay(std::size_t bytes);
@@ -130,6 +138,7 @@ private:
     std::deque<foundation::Dictionary> keptAside_;
     std::vector<Kind> kinds_;
     std::unordered_map<std::string, std::uint32_t> kindByKey_;
+    std::optional<Recent> recent_; // the message before this one
     std::size_t size_ = 0;
     std::size_t paid_ = 0;
     std::string scratch_;

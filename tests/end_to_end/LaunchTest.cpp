@@ -19,6 +19,8 @@ struct BadLaunch {
     std::string name;
     Kestod::Environment environment;
     std::string reason;
+
+    friend void PrintTo(const BadLaunch& launch, std::ostream* stream) { *stream << launch.reason; }
 };
 
 class BadLaunchTest : public testing::TestWithParam<BadLaunch> { };

@@ -112,10 +112,10 @@ inline rc::Gen<Messages> payloads()
     });
 }
 
-// So many of them, that each run of a property tries: a hundred runs are thousands of stores.
-inline rc::Gen<std::vector<Messages>> manyPayloads()
+// So many of them: a property runs a hundred times, and thousands of stores are to be tried.
+inline rc::Gen<std::vector<Messages>> manyPayloads(std::size_t count)
 {
-    return rc::gen::container<std::vector<Messages>>(30, payloads());
+    return rc::gen::container<std::vector<Messages>>(count, payloads());
 }
 
 } // namespace generated

@@ -136,7 +136,7 @@ TEST(RapidMessages, AreThoseWithAnyOfTheKeysWhateverItsValue)
 RC_GTEST_PROP(RapidMessages, AreWhatTheirDefinitionMakesOfThem, ())
 {
     const auto pause = *rc::gen::element(2.0, 0.5, 0.0, -1.0, 1e6);
-    for (const Messages& payloads : *generated::manyPayloads()) {
+    for (const Messages& payloads : *generated::manyPayloads(30)) {
         const auto store = storeOf(payloads);
         const Messages combined = KestoReportingSession::combineRapidMessages(*store, switches, pause);
         const Messages expected = naive::combineRapidMessages(

@@ -1,6 +1,7 @@
 // The summary file: where it is, what it is called, what it holds, and what is said when it cannot be.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
+#include "support/ParseJson.h"
 #include "support/TestPlatform.h"
 
 #include <algorithm>
@@ -8,7 +9,6 @@
 #include <ctime>
 #include <gmock/gmock.h>
 #include <rapidcheck/gtest.h>
-#include <rapidjson/document.h>
 
 namespace {
 
@@ -28,40 +28,11 @@ using testing::StartsWith;
 
 constexpr AudioEventCategory playback = 4;
 
-// What another reader of JSON makes of the text.
-Value fromJson(const rapidjson::Value& json)
-{
-    if (json.IsObject()) {
-        Dictionary::Entries entries;
-        for (const auto& member : json.GetObject())
-            entries.push_back(
-                {std::string_view(member.name.GetString(), member.name.GetStringLength()), fromJson(member.value)});
-        return Dictionary(std::move(entries));
-    }
-    if (json.IsArray()) {
-        std::vector<Value> values;
-        for (const auto& element : json.GetArray())
-            values.push_back(fromJson(element));
-        return foundation::Array(std::move(values));
-    }
-    if (json.IsString())
-        return std::string_view(json.GetString(), json.GetStringLength());
-    if (json.IsBool())
-        return json.GetBool();
-    if (json.IsInt64())
-        return json.GetInt64();
-    if (json.IsUint64())
-        return json.GetUint64();
-    return json.IsNumber() ? Value(json.GetDouble()) : Value();
-}
-
 Value parse(const std::string& text)
 {
-    rapidjson::Document document;
-    document.Parse<rapidjson::kParseFullPrecisionFlag | rapidjson::kParseValidateEncodingFlag>(text.data(),
-                                                                                               text.size());
-    EXPECT_FALSE(document.HasParseError()) << text;
-    return fromJson(document);
+    const auto value = support::parseJson(text);
+    EXPECT_TRUE(value.has_value()) << text;
+    return value.value_or(Value());
 }
 
 // The process's time zone, until it is gone.
@@ -331,7 +302,7 @@ RC_GTEST_PROP(SummaryFileOfAnyStore, SaysToAnotherReaderWhatTheStoreHolds, ())
 {
     support::TestPlatform platform;
     platform.deviceProperties.setInternalBuild(true);
-    for (const Messages& payloads : *generated::manyPayloads()) {
+    for (const Messages& payloads : *generated::manyPayloads(10)) {
         const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{});
         session->start();
         for (const Dictionary& payload : payloads)

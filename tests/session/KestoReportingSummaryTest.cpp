@@ -169,7 +169,7 @@ RC_GTEST_PROP(SummaryOfAnyStore, IsWhatItsDefinitionMakesOfIt, ())
     support::TestPlatform platform;
     platform.deviceProperties.setInternalBuild(true);
     const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{});
-    for (const Messages& payloads : *generated::manyPayloads()) {
+    for (const Messages& payloads : *generated::manyPayloads(20)) {
         const auto serviceType = *rc::gen::arbitrary<AudioServiceType>();
         session->setServiceType(serviceType);
         session->start();

@@ -464,7 +464,7 @@ RC_GTEST_PROP(VolumeMessagesOfAnyStore, AreWhatTheirDefinitionMakesOfIt, ())
     support::TestPlatform platform;
     const auto process = *rc::gen::weightedElement<std::optional<Value>>({{8, Value("player")}, {1, std::nullopt}});
     const auto minimum = *rc::gen::element(0.5, 0.5, 0.0, -10.0);
-    for (const Messages& payloads : *generated::manyPayloads()) {
+    for (const Messages& payloads : *generated::manyPayloads(30)) {
         const auto store = storeOf(payloads);
         platform.log.clear();
         const Messages events = KestoReportingSession::createVolumeMessages(*store, process, minimum);
@@ -474,7 +474,6 @@ RC_GTEST_PROP(VolumeMessagesOfAnyStore, AreWhatTheirDefinitionMakesOfIt, ())
         for (const auto& line : platform.log.lines())
             said.push_back(line.message);
         RC_ASSERT(said == expected.logLines);
-        RC_CLASSIFY(events.size() > 1, "several events");
     }
 }
 
