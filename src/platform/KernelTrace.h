@@ -20,6 +20,9 @@ struct KernelTraceEvent {
 };
 
 // One trace session. Its handlers run on the queue that `start` was given, in the order of time.
+//
+// It may be destroyed by its own completion handler. Destroyed before it has ended, it is never completed; what is
+// on its way to the queue already may still be delivered.
 class KernelTraceSession {
 public:
     virtual ~KernelTraceSession() = default;
