@@ -297,11 +297,15 @@ Dictionary::Dictionary(Entries entries)
 
 Dictionary Dictionary::with(String key, Value value) const
 {
+    const auto place = std::ranges::find(entries(), key, &Entry::key);
     Entries changed;
     changed.reserve(size() + 1);
     changed.assign(begin(), end());
-    changed.push_back({std::move(key), std::move(value)});
-    return changed;
+    if (place == end())
+        changed.push_back({std::move(key), std::move(value)});
+    else
+        changed[static_cast<std::size_t>(place - begin())].value = std::move(value);
+    return Reference<DictionaryObject>::adopt(new DictionaryObject(DistinctKeys(), std::move(changed)));
 }
 
 Dictionary Dictionary::without(std::string_view key) const
@@ -323,18 +327,24 @@ Dictionary Dictionary::mergedWith(const Dictionary& other) const
     return all;
 }
 
+// As long as both have the same keys in the same places, only what differs is asked whether it counts.
 bool Dictionary::isEqualIgnoring(const Dictionary& other, std::span<const std::string_view> keys) const noexcept
 {
     const auto counts = [keys](const Entry& entry) { return std::ranges::find(keys, entry.key.view()) == keys.end(); };
-    const auto theirs = other.entries();
+    auto ours = entries();
+    auto theirs = other.entries();
+    while (!ours.empty() && !theirs.empty() && ours.front().key == theirs.front().key) {
+        if (ours.front().value != theirs.front().value && counts(ours.front()))
+            return false;
+        ours = ours.subspan(1);
+        theirs = theirs.subspan(1);
+    }
     std::size_t counted = 0;
-    for (std::size_t position = 0; const Entry& entry : entries()) {
-        const std::size_t here = position++;
+    for (const Entry& entry : ours) {
         if (!counts(entry))
             continue;
         ++counted;
-        const bool samePlace = here < theirs.size() && theirs[here].key == entry.key;
-        const Value* value = samePlace ? &theirs[here].value : other.find(entry.key);
+        const Value* const value = other.find(entry.key);
         if (value == nullptr || *value != entry.value)
             return false;
     }

@@ -5,7 +5,10 @@
 #include "platform/Platform.h"
 #include "utility/KestoReportingUtility.h"
 
+#include <array>
 #include <mutex>
+#include <optional>
+#include <string>
 
 namespace {
 
@@ -35,25 +38,52 @@ private:
     std::shared_ptr<const KestoReportingSinkSession> session_;
 };
 
+// The names of a message's two events.
+struct EventNames {
+    AudioEventCategory category;
+    AudioEventType type;
+    AudioServiceType serviceType;
+    std::string ofAllServices;
+    std::string ofItsService;
+};
+
+EventNames makeEventNames(AudioEventCategory category, AudioEventType type, AudioServiceType serviceType)
+{
+    const std::string categoryName = KestoReportingUtilityCategoryString(category);
+    const std::string_view typeName = KestoReportingUtilityTypeString(type);
+    const auto serviceName = KestoReportingUtilityGenerateServiceNameFromServiceType(serviceType);
+    return {category, type, serviceType, foundation::format("com.quarn.kesto.{}.{}", categoryName, typeName),
+            foundation::format("com.quarn.{}.{}.{}", serviceName, categoryName, typeName)};
+}
+
+// Sessions say the same few things over and over: a thread's recent names are remembered, each at a place that its
+// numbers give.
+const EventNames& eventNames(AudioEventCategory category, AudioEventType type, AudioServiceType serviceType)
+{
+    constexpr std::size_t remembered = 64;
+    thread_local std::array<std::optional<EventNames>, remembered> recent;
+    auto& names = recent[(category * 5 + type * 3 + serviceType) % remembered];
+    if (!names || names->category != category || names->type != type || names->serviceType != serviceType)
+        names = makeEventNames(category, type, serviceType);
+    return *names;
+}
+
 } // namespace
 
 void KestoReportingFennicBridge::handleEvent(const foundation::Dictionary& message, AudioEventCategory category,
                                              AudioEventType type,
                                              const std::shared_ptr<const KestoReportingSinkSession>& session)
 {
-    const std::string categoryName = KestoReportingUtilityCategoryString(category);
-    const std::string_view typeName = KestoReportingUtilityTypeString(type);
-    const auto serviceName = KestoReportingUtilityGenerateServiceNameFromServiceType(session->serviceType());
-
     platform::Analytics& analytics = platform::current().analytics;
     std::shared_ptr<LazyPayload> payload;
-    const auto offer = [&](std::string eventName) {
+    const auto offer = [&](const std::string& eventName) {
         if (!analytics.isAnalyticsEventUsed(eventName))
             return;
         if (!payload)
             payload = std::make_shared<LazyPayload>(message, session);
-        analytics.sendAnalyticsEventLazy(std::move(eventName), [payload] { return payload->build(); });
+        analytics.sendAnalyticsEventLazy(eventName, [payload] { return payload->build(); });
     };
-    offer(foundation::format("com.quarn.kesto.{}.{}", categoryName, typeName));
-    offer(foundation::format("com.quarn.{}.{}.{}", serviceName, categoryName, typeName));
+    const EventNames& names = eventNames(category, type, session->serviceType());
+    offer(names.ofAllServices);
+    offer(names.ofItsService);
 }

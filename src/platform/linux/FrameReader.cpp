@@ -1,6 +1,7 @@
 #include "platform/linux/FrameReader.h"
 
 #include <algorithm>
+#include <array>
 #include <cassert>
 
 namespace platform {
@@ -19,9 +20,10 @@ std::size_t announcedLength(std::string_view head) noexcept
 void appendFrame(std::string_view frame, std::string& out)
 {
     assert(frame.size() <= longestFrame);
+    std::array<char, frameHeadSize> head;
     for (std::size_t index = 0; index < frameHeadSize; ++index)
-        out.push_back(static_cast<char>(frame.size() >> 8 * index));
-    out += frame;
+        head[index] = static_cast<char>(frame.size() >> 8 * index);
+    out.append(head.data(), head.size()).append(frame);
 }
 
 void FrameReader::feed(std::string_view bytes) noexcept
