@@ -7,6 +7,10 @@
 #include "platform/Absent.h"
 #include "platform/Platform.h"
 
+#include <string>
+#include <utility>
+#include <vector>
+
 namespace bench {
 
 class InProcessPlatform {
@@ -33,6 +37,9 @@ public:
     ~InProcessPlatform() { platform::uninstall(); }
     InProcessPlatform(const InProcessPlatform&) = delete;
     InProcessPlatform& operator=(const InProcessPlatform&) = delete;
+
+    // Gives every notification that state, and calls whoever is registered for the name.
+    void post(std::string_view name, std::uint64_t state) { notifications_.post(name, state); }
 
 private:
     class Log final : public platform::Log {
@@ -86,6 +93,30 @@ private:
             return platform::ProcessTableEntry{identifier, "player"};
         }
     };
+    class Notifications final : public platform::Notifications {
+    public:
+        void post(std::string_view name, std::uint64_t state)
+        {
+            state_ = state;
+            for (std::size_t index = 0; index < registered_.size(); ++index)
+                if (registered_[index].first == name)
+                    registered_[index].second(static_cast<std::int32_t>(index + 1));
+        }
+
+    private:
+        Registration registerNotification(std::string_view name, std::shared_ptr<platform::WorkQueue>,
+                                          Handler handler) override
+        {
+            registered_.emplace_back(name, std::move(handler));
+            return {.status = 0, .token = static_cast<std::int32_t>(registered_.size())};
+        }
+        [[nodiscard]] std::expected<std::uint64_t, platform::NotificationStatus> state(std::int32_t) const override
+        {
+            return state_;
+        }
+        std::vector<std::pair<std::string, Handler>> registered_;
+        std::uint64_t state_ = 0;
+    };
     class Analytics final : public platform::Analytics {
         [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
         void sendAnalyticsEventLazy(std::string, PayloadBuilder) override { }
@@ -102,6 +133,11 @@ private:
         {
             return std::unexpected(std::make_error_code(std::errc::permission_denied));
         }
+        [[nodiscard]] std::expected<std::string, std::error_code> readFile(const std::filesystem::path&,
+                                                                           std::size_t) override
+        {
+            return std::unexpected(std::make_error_code(std::errc::permission_denied));
+        }
     };
 
     Log log_;
@@ -111,7 +147,7 @@ private:
     FeatureFlags featureFlags_;
     DeviceProperties deviceProperties_;
     ProcessTable processTable_;
-    platform::AbsentNotifications notifications_;
+    Notifications notifications_;
     Analytics analytics_;
     platform::AbsentTraceMarkers traceMarkers_;
     platform::AbsentReportingChannels reportingChannels_;

@@ -2,10 +2,9 @@
 //
 // Found again and again, as the sessions of a client that is sending are; after a pause in which the processor's caches
 // were used for something else; and all of them in no order, which is as much as memory can be made to do.
+#include "CrowdedService.h"
 #include "Groups.h"
 #include "InProcessPlatform.h"
-#include "platform/Connection.h"
-#include "service/KestoReportingServiceDelegate.h"
 
 #include <algorithm>
 #include <fmt/format.h>
@@ -16,64 +15,7 @@
 namespace bench {
 namespace {
 
-constexpr std::int64_t sessionsEach = 10;
-
-class NoListener final : public platform::ConnectionListener {
-    void setDelegate(platform::ConnectionListenerDelegate&) override { }
-    void resume() override { }
-    void stop() override { }
-};
-
-// A connection without a socket: it delivers the calls that it is told to.
-class Connection final : public platform::Connection {
-public:
-    void deliver(foundation::Array call) { (void)callHandler_({std::move(call), nullptr}); }
-
-private:
-    [[nodiscard]] std::int32_t processIdentifier() const override { return 1; }
-    [[nodiscard]] std::string description() const override { return "connection"; }
-    void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
-    void setInterruptionHandler(EndHandler) override { }
-    void setInvalidationHandler(EndHandler) override { }
-    void resume() override { }
-    void send(std::string) override { }
-
-    CallHandler callHandler_;
-};
-
-// A service with so many clients, whose sessions' IDs count up from 1.
-class CrowdedService {
-public:
-    explicit CrowdedService(std::int64_t clients)
-    {
-        constexpr int createReportingSession = 1;
-        NoListener listener;
-        for (std::int64_t client = 0; client < clients; ++client) {
-            const auto& connection = connections_.emplace_back(std::make_shared<Connection>());
-            service_->shouldAcceptNewConnection(listener, connection);
-            for (std::int64_t session = 1; session <= sessionsEach; ++session)
-                connection->deliver({1, createReportingSession, client * sessionsEach + session});
-        }
-    }
-
-    // Nanoseconds to find one of these.
-    double costOf(std::span<const std::int64_t> reporterIDs)
-    {
-        return nanosecondsEach(reporterIDs.size(), [&](std::size_t each) { find(reporterIDs[each]); });
-    }
-
-    void find(std::int64_t reporterID)
-    {
-        const auto session = service_->findReportingSessionForID(reporterID);
-        if (!session)
-            throw std::runtime_error("a session is not found");
-        use(session);
-    }
-
-private:
-    std::vector<std::shared_ptr<Connection>> connections_;
-    std::shared_ptr<KestoReportingServiceDelegate> service_ = KestoReportingServiceDelegate::make();
-};
+constexpr auto sessionsEach = CrowdedService::sessionsEach;
 
 using ReporterIDs = std::vector<std::int64_t>;
 
@@ -94,6 +36,12 @@ void displaceCaches()
     static std::vector<char> memory(size);
     for (std::size_t at = 0; at < size; at += line)
         ++memory[at];
+}
+
+// Nanoseconds to find one of these.
+double costOf(CrowdedService& service, std::span<const std::int64_t> reporterIDs)
+{
+    return nanosecondsEach(reporterIDs.size(), [&](std::size_t each) { service.find(reporterIDs[each]); });
 }
 
 // What finding a client's sessions costs after a pause, for clients chosen at random among so many.
@@ -131,9 +79,9 @@ void measureLookup(const Options& options, Report& report)
 
     const std::string what = fmt::format("finding a session among {} clients", clients);
     const auto costs = compete(
-        options, what, [&] { return crowd.costOf(oneOfMany); }, [&] { return single.costOf(theOnly); },
+        options, what, [&] { return costOf(crowd, oneOfMany); }, [&] { return costOf(single, theOnly); },
         [&] { return costAfterPause(crowd, clients); }, [&] { return costAfterPause(single, 1); },
-        [&] { return crowd.costOf(everySession); });
+        [&] { return costOf(crowd, everySession); });
     const std::string peer = "with one client";
     report.add({what + ", again and again", "ns", costs[0], Peer{peer, costs[1]}, Target::ratioAtMost(2)});
     report.add({what + ", after a pause", "ns", costs[2], Peer{peer, costs[3]}, Target::ratioAtMost(2)});

@@ -1,0 +1,27 @@
+// A device-wide setting changes: every session of every client is told.
+#include "CrowdedService.h"
+#include "Groups.h"
+#include "InProcessPlatform.h"
+
+#include <fmt/format.h>
+
+namespace bench {
+
+void measureNotification(const Options& options, Report& report)
+{
+    constexpr std::int64_t clients = 1'000;
+    constexpr std::string_view ringerSwitch = "com.quarn.halden.ringerstate";
+    InProcessPlatform platform;
+    showProgress(fmt::format("connecting {} clients", clients));
+    const CrowdedService service(clients, CrowdedService::Sessions::Started);
+    std::uint64_t state = 0;
+    const std::string what =
+        fmt::format("a notification to {} clients of {} sessions", clients, CrowdedService::sessionsEach);
+    const auto times = compete(options, what, [&] {
+        state ^= 1; // so that no session drops it as a repeat
+        return nanosecondsEach(1, [&](std::size_t) { platform.post(ringerSwitch, state); }) / 1e6;
+    });
+    report.add({what, "ms", times[0], {}, Target::figureAtMost(20)});
+}
+
+} // namespace bench
