@@ -305,7 +305,7 @@ Dictionary Dictionary::with(String key, Value value) const
         changed.push_back({std::move(key), std::move(value)});
     else
         changed[static_cast<std::size_t>(place - begin())].value = std::move(value);
-    return Reference<DictionaryObject>::adopt(new DictionaryObject(DistinctKeys(), std::move(changed)));
+    return changed;
 }
 
 Dictionary Dictionary::without(std::string_view key) const
