@@ -9,7 +9,7 @@
 #include "foundation/Mutex.h"
 #include "platform/Connection.h"
 #include "service/KestoReportingReporterIndex.h"
-#include "sinks/KestoReportingUtilityVorpStateManager.h"
+#include "sinks/KestoReportingVorpStateManagerUtility.h"
 
 #include <atomic>
 #include <cstdint>

@@ -1,4 +1,4 @@
-#include "sinks/KestoReportingUtilityVorpStateManager.h"
+#include "sinks/KestoReportingVorpStateManagerUtility.h"
 
 #include "platform/Platform.h"
 #include "utility/KestoReportingUtility.h"

@@ -22,6 +22,8 @@ public:
     [[nodiscard]] std::uint64_t leakedHapticsSessionCounter() const { return leakedHapticsSessionCounter_; }
     // The report counted last.
     [[nodiscard]] const foundation::Dictionary& messageCache() const { return messageCache_; }
+    // The reporter of the snapshot requested last; null before the first.
+    [[nodiscard]] const platform::BugCaptureReporter* ulmetReporter() const { return ulmetReporter_.get(); }
 
 private:
     void requestSnapshot(AudioEventCategory category, const KestoReportingSinkSession& session,
@@ -29,5 +31,5 @@ private:
 
     std::uint64_t leakedHapticsSessionCounter_ = 0;
     foundation::Dictionary messageCache_;
-    std::unique_ptr<platform::BugCaptureReporter> ulmetReporter_; // of the snapshot requested last
+    std::unique_ptr<platform::BugCaptureReporter> ulmetReporter_;
 };
