@@ -19,6 +19,9 @@ add_compile_options(-Wall -Wextra -Wpedantic -Werror -Wshadow -Wimplicit-fallthr
                     $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
                     $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety>)
 
+# A program needs only the libraries that it uses, of those that its layers use.
+add_link_options(-Wl,--as-needed)
+
 if(KESTO_SANITIZE)
   add_compile_options(-fsanitize=${KESTO_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer)
   add_link_options(-fsanitize=${KESTO_SANITIZE})

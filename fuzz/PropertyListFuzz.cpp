@@ -1,0 +1,77 @@
+// Property lists are read from files that any client may name. Whatever the bytes, reading must end with a failure in
+// words or with a value within the limits; and that value must be one like any other, which survives its encoding.
+#include "foundation/Cbor.h"
+#include "foundation/PropertyList.h"
+
+#include <algorithm>
+#include <cstdint>
+#include <cstdlib>
+#include <string>
+
+namespace {
+
+using foundation::Value;
+
+void require(bool holds)
+{
+    if (!holds)
+        std::abort();
+}
+
+struct Measure {
+    std::size_t objects = 0;
+    std::size_t content = 0;
+    unsigned depth = 0;
+};
+
+void measure(const Value& value, unsigned depth, Measure& all)
+{
+    ++all.objects;
+    if (value.kind() == Value::Kind::String)
+        require(foundation::isValidUtf8(value.stringView()));
+    if (const auto data = value.data())
+        all.content += data->bytes.view().size();
+    all.content += value.stringView().size();
+    const bool isContainer = value.kind() == Value::Kind::Array || value.kind() == Value::Kind::Dictionary;
+    all.depth = std::max(all.depth, isContainer ? depth + 1 : depth);
+    if (const auto array = value.array())
+        for (const Value& element : *array)
+            measure(element, depth + 1, all);
+    if (const auto dictionary = value.dictionary())
+        for (const auto& [key, element] : *dictionary) {
+            measure(key, depth + 1, all);
+            measure(element, depth + 1, all);
+        }
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    // Small, so that inputs of a fuzzer's size meet them.
+    constexpr foundation::PropertyListLimits limits{.bytes = 65536, .depth = 16, .objects = 1024, .content = 8192};
+    const std::string_view bytes(reinterpret_cast<const char*>(data), size);
+    const auto read = foundation::readPropertyList(bytes, limits);
+    if (!read) {
+        require(!read.error().text.empty() && foundation::isValidUtf8(read.error().text));
+        return 0;
+    }
+    Measure all;
+    measure(*read, 0, all);
+    require(size <= limits.bytes && all.objects <= limits.objects && all.depth <= limits.depth);
+    // The key that a UID is given stands in no file. Text in XML is bounded by the file.
+    constexpr std::size_t uidKey = std::string_view("CF$UID").size();
+    require(all.content <= std::max(limits.content + all.objects * uidKey, size));
+
+    std::string encoded;
+    foundation::appendCbor(*read, encoded);
+    foundation::CborDecoder decoder;
+    const auto decoded = decoder.decode(encoded);
+    require(decoded.has_value());
+    std::string reencoded;
+    foundation::appendCbor(*decoded, reencoded);
+    require(encoded == reencoded); // stronger than equality of the values, which NaN never has
+
+    static_cast<void>(read->text()); // what a log line would write of it
+    return 0;
+}
