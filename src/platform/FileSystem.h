@@ -1,9 +1,11 @@
-// The few things that the service does with files of its own, all of them below one folder.
+// The few things that the service does with files: it writes those of its own, all of them below one folder, and reads
+// those that clients name.
 #pragma once
 
 #include <expected>
 #include <filesystem>
 #include <memory>
+#include <string>
 #include <string_view>
 #include <system_error>
 
@@ -21,7 +23,7 @@ public:
     [[nodiscard]] virtual std::expected<void, std::error_code> commit() = 0;
 };
 
-// Paths lie below the diagnostic-log root; others are errors. Any thread.
+// Any thread. What is written lies below the diagnostic-log root; other paths are errors.
 class FileSystem {
 public:
     virtual ~FileSystem() = default;
@@ -33,6 +35,10 @@ public:
                                                                                  unsigned permissions) = 0;
     [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) = 0;
+    // The bytes of a file anywhere, whoever named it. Does not wait, and takes no more memory than the limit (bytes):
+    // `errc::file_too_large` when the file is longer, `errc::invalid_argument` when the path is no regular file's.
+    [[nodiscard]] virtual std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,
+                                                                               std::size_t limit) = 0;
 };
 
 } // namespace platform

@@ -18,6 +18,7 @@ public:
     std::error_code directoryError; // of the next attempts, unless it is none
     std::error_code createError;
     std::error_code writeError;
+    platform::FileSystem* disk = nullptr; // reads what `readFile` is asked for, if there is one
 
     [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return "/diagnostics"; }
     std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
@@ -34,6 +35,17 @@ public:
         if (createError)
             return std::unexpected(createError);
         return std::make_unique<File>(*this, path);
+    }
+    std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path, std::size_t limit) override
+    {
+        if (disk != nullptr)
+            return disk->readFile(path, limit);
+        const auto found = files.find(path);
+        if (found == files.end())
+            return std::unexpected(make_error_code(std::errc::no_such_file_or_directory));
+        if (found->second.size() > limit)
+            return std::unexpected(make_error_code(std::errc::file_too_large));
+        return found->second;
     }
 
 private:

@@ -1,6 +1,8 @@
+// Paths are taken apart and walked one folder at a time, each by its descriptor: what was checked is what is used.
 #include "platform/linux/LinuxFileSystem.h"
 
 #include "foundation/Format.h"
+#include "platform/linux/SmallFile.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -129,10 +131,25 @@ LinuxFileSystem::createAtomically(const std::filesystem::path& path)
     std::string name = temporaryFileName();
     FileDescriptor file(
         ::openat(directory->get(), name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByAll));
-    if (!file)
+    if (!file || ::fchmod(file.get(), readableByAll) != 0) // the umask took its part, as it does of folders
         return std::unexpected(lastError());
     return std::make_unique<LinuxAtomicFile>(*std::move(directory), std::move(file), std::move(name),
                                              path.filename().string());
+}
+
+std::expected<std::string, std::error_code> LinuxFileSystem::readFile(const std::filesystem::path& path,
+                                                                      std::size_t limit)
+{
+    const std::unexpected notAFile(std::make_error_code(std::errc::invalid_argument));
+    if (path.native().contains('\0')) // the system would take what is before it for the path
+        return notAFile;
+    const FileDescriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
+    struct stat status = {};
+    if (!place || ::fstat(place.get(), &status) != 0)
+        return std::unexpected(lastError());
+    if (!S_ISREG(status.st_mode))
+        return notAFile;
+    return readSmallFile(foundation::format("/proc/self/fd/{}", place.get()), limit);
 }
 
 } // namespace platform

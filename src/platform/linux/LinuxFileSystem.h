@@ -1,4 +1,4 @@
-// Folders and files of the service's own, on the real file system.
+// Folders and files of the service's own, and files that clients name, on the real file system.
 //
 // A file is written under a name of its own beside its place and then renamed, so that whoever reads it sees the
 // old one or the new one and never half of it.
@@ -7,6 +7,9 @@
 // folder would have the service write, or open to everybody, where its maker may not. So every step below the
 // diagnostic-log root is taken from the folder before it, and none through a link. The root itself may be one: it is
 // the administrator's.
+//
+// A client may name a device, and of a device even the opening may do something. So what is named is only pointed at,
+// looked at, and opened as what was seen.
 #pragma once
 
 #include "platform/FileSystem.h"
@@ -28,6 +31,8 @@ public:
                                                                          unsigned permissions) override;
     [[nodiscard]] std::expected<std::unique_ptr<AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) override;
+    [[nodiscard]] std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,
+                                                                       std::size_t limit) override;
 
 private:
     // Steps down from the root, and makes the folders on the way that are missing, if there are permissions for them.

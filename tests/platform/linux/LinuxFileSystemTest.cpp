@@ -2,9 +2,11 @@
 #include "platform/linux/LinuxFileSystem.h"
 #include "platform/linux/TemporaryDirectory.h"
 
+#include <array>
 #include <csignal>
 #include <fcntl.h>
 #include <gmock/gmock.h>
+#include <sys/inotify.h>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -169,7 +171,7 @@ TEST_F(FileSystem, WritesAFileAtOnceWhenItIsCommitted)
     EXPECT_EQ(support::readFile(root / "a.json"), "one and two");
     file->reset();
     EXPECT_THAT(namesIn(root), ElementsAre("a.json"));
-    EXPECT_EQ(permissionsOf(root / "a.json") & 0600U, 0600U);
+    EXPECT_EQ(permissionsOf(root / "a.json"), 0644U);
 }
 
 TEST_F(FileSystem, TakesThePlaceOfAnEarlierFileAndLeavesItsReadersTheOldOne)
@@ -284,6 +286,46 @@ TEST_F(FileSystem, StaysInAFolderThatIsMovedAwayMeanwhile)
     ASSERT_TRUE((*file)->commit());
     EXPECT_THAT(namesIn(root / "elsewhere"), IsEmpty());
     EXPECT_THAT(namesIn(root / "moved"), ElementsAre("a.json"));
+}
+
+// --- reading
+
+TEST_F(FileSystem, ReadsFilesAnywhereUpToTheLimit)
+{
+    const support::TemporaryDirectory elsewhere;
+    const std::string text("some\0bytes", 10);
+    support::writeFile(elsewhere.path() / "file", text);
+    EXPECT_EQ(files.readFile(elsewhere.path() / "file", 10).value(), text);
+    EXPECT_EQ(files.readFile(elsewhere.path() / "file", 1 << 20).value(), text);
+    EXPECT_EQ(files.readFile(elsewhere.path() / "file", 9).error(), std::errc::file_too_large);
+    support::writeFile(elsewhere.path() / "empty", "");
+    EXPECT_EQ(files.readFile(elsewhere.path() / "empty", 0).value(), "");
+}
+
+TEST_F(FileSystem, SaysWhyAFileCannotBeRead)
+{
+    EXPECT_EQ(files.readFile(root / "missing", 10).error(), std::errc::no_such_file_or_directory);
+    EXPECT_EQ(files.readFile(root, 10).error(), std::errc::invalid_argument);
+    support::writeFile(root / "secret", "text");
+    ASSERT_EQ(::chmod((root / "secret").c_str(), 0), 0);
+    ASSERT_EQ(::chmod(root.c_str(), 0755), 0);
+    EXPECT_TRUE(inChild(
+        [&] { return becomeNobody() && files.readFile(root / "secret", 10).error() == std::errc::permission_denied; }));
+}
+
+// Of a device the opening alone may do something. The kernel tells who opens what.
+TEST_F(FileSystem, DoesNotOpenWhatIsNoFile)
+{
+    ASSERT_EQ(::mkfifo((root / "pipe").c_str(), 0600), 0);
+    const platform::FileDescriptor watch(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));
+    ASSERT_GE(::inotify_add_watch(watch.get(), root.c_str(), IN_OPEN), 0);
+    std::array<char, 4096> events{};
+
+    EXPECT_EQ(files.readFile(root / "pipe", 10).error(), std::errc::invalid_argument);
+    EXPECT_LT(::read(watch.get(), events.data(), events.size()), 0) << "it was opened";
+
+    const platform::FileDescriptor opened(::open((root / "pipe").c_str(), O_RDONLY | O_NONBLOCK | O_CLOEXEC));
+    EXPECT_GT(::read(watch.get(), events.data(), events.size()), 0) << "and would have been seen";
 }
 
 } // namespace
