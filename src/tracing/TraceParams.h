@@ -1,0 +1,67 @@
+// What a trace-parameters file says: which kernel events delimit the intervals that a trace measures; and the words in
+// which such files say it, for those who write them.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+// Of the file.
+inline constexpr std::string_view TraceParamChildrenNodes = "Children"; // the traces
+
+// Of each trace.
+inline constexpr std::string_view TraceDataDescription = "Name";
+inline constexpr std::string_view TraceDataType = "TraceType";
+inline constexpr std::string_view TraceDataTypekTrace = "ktrace"; // what every type but the next one counts as
+inline constexpr std::string_view TraceDataTypeOSSignpost = "OSSignpost";
+inline constexpr std::string_view TraceDataIsCritical = "IsCritical"; // for whoever writes files; never read
+inline constexpr std::string_view TraceDataChildrenNodes = "Children"; // its points
+
+// Of each point. Codes are text in hexadecimal digits.
+inline constexpr std::string_view TracePointDescription = "Name";
+inline constexpr std::string_view TracePointType = "Type";
+inline constexpr std::string_view TracePointTypeInterval = "Interval";
+inline constexpr std::string_view TracePointTypeImpulse = "Impulse";
+inline constexpr std::string_view TracePointTypeLevel = "Level";
+inline constexpr std::string_view TracePointBeginCode = "KTraceCodeBegin";
+inline constexpr std::string_view TracePointEndCode = "KTraceCodeEnd";
+inline constexpr std::string_view TracePointEventsMatchedBy = "EventsMatchedBy";
+inline constexpr std::string_view TracePointEventsMatchedByThread = "Thread";
+inline constexpr std::string_view TracePointEventsMatchedByProcess = "Process"; // as all but "Thread": any thread
+
+// One point: the codes of the events that begin and end what it measures.
+struct TraceDataParams {
+    static constexpr std::uint32_t impulse = 0;
+    static constexpr std::uint32_t interval = 1;
+    static constexpr std::uint32_t level = 2;
+
+    // An impulse ends with the event that begins it, whatever end code is given.
+    TraceDataParams(std::string givenName, std::uint32_t type, std::uint32_t begin, std::uint32_t end, bool byThread)
+        : name(std::move(givenName)),
+          pointType(type),
+          beginCode(begin),
+          endCode(type != impulse ? end : begin),
+          matchByThread(byThread)
+    {
+    }
+
+    std::string name;
+    std::uint32_t pointType;
+    std::uint32_t beginCode;
+    std::uint32_t endCode;
+    bool matchByThread; // whether both events must come from one thread
+
+    friend bool operator==(const TraceDataParams&, const TraceDataParams&) = default;
+};
+
+// One file: the points of all its traces, under the name of the first that has one.
+struct TraceParams {
+    static constexpr std::int32_t kernelTrace = 0;
+    static constexpr std::int32_t signpostTrace = 1;
+
+    std::string name;
+    std::int32_t traceType = kernelTrace;
+    std::vector<TraceDataParams> traceDataParams; // in the order of the file
+};
