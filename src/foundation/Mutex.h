@@ -50,11 +50,13 @@ public:
         condition_.wait(lock);
         lock.release(); // the caller goes on holding it
     }
-    void waitUntil(Mutex& mutex, std::chrono::steady_clock::time_point deadline) KESTO_REQUIRES(mutex)
+    // Tells whether it woke because of the deadline.
+    std::cv_status waitUntil(Mutex& mutex, std::chrono::steady_clock::time_point deadline) KESTO_REQUIRES(mutex)
     {
         std::unique_lock lock(mutex.mutex_, std::adopt_lock);
-        condition_.wait_until(lock, deadline);
+        const std::cv_status status = condition_.wait_until(lock, deadline);
         lock.release();
+        return status;
     }
     void notifyOne() noexcept { condition_.notify_one(); }
     void notifyAll() noexcept { condition_.notify_all(); }

@@ -9,6 +9,18 @@
 #include <chrono>
 #include <cmath>
 
+namespace {
+
+// Of a wait that begins now.
+std::chrono::steady_clock::time_point deadline(double timeout)
+{
+    constexpr double longest = 1e9; // seconds; some thirty years, which every clock can hold
+    const std::chrono::duration<double> bounded(std::fmax(0, std::fmin(timeout, longest)));
+    return std::chrono::steady_clock::now() + std::chrono::duration_cast<std::chrono::nanoseconds>(bounded);
+}
+
+} // namespace
+
 bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeout, const bool& flag,
                                std::string_view waitMessage, std::string_view timeoutMessage,
                                platform::LogCategory& logCategory)
@@ -16,8 +28,7 @@ bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeou
     const foundation::Lock lock(condition.lock);
     while (!flag) {
         KESTO_LOG(logCategory, Info, "{}", waitMessage);
-        const auto waited = condition.signal.wait_for(condition.lock, std::chrono::duration<double>(timeout));
-        if (waited == std::cv_status::timeout) {
+        if (condition.signal.waitUntil(condition.lock, deadline(timeout)) == std::cv_status::timeout) {
             KESTO_LOG(logCategory, Error, "{}", timeoutMessage);
             return false;
         }
@@ -30,21 +41,25 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 {
     const foundation::Lock lock(condition.lock);
     flag = true;
-    condition.signal.notify_one();
+    condition.signal.notifyOne();
 }
 
 bool KestoReportingUtilityIsInternalBuild()
 {
-    // The number of the platform's installation that was asked, and above it the answer's bit.
+    // The number of the platform's installation that was asked, and below it the answer's bit.
     static std::atomic<std::uint64_t> remembered;
     const std::uint64_t installation = platform::installationNumber();
-    std::uint64_t answer = remembered.load(std::memory_order_relaxed);
-    if (answer >> 1 != installation) {
-        answer = installation << 1
-            | (platform::current().deviceProperties.boolean("InternalBuild").value_or(false) ? 1U : 0U);
-        remembered.store(answer, std::memory_order_relaxed);
+    const auto isRemembered = [&] { return remembered.load(std::memory_order_relaxed) >> 1 == installation; };
+    if (!isRemembered()) {
+        static foundation::Mutex asking;
+        const foundation::Lock lock(asking);
+        if (!isRemembered())
+            remembered.store(
+                installation << 1
+                    | (platform::current().deviceProperties.boolean("InternalBuild").value_or(false) ? 1U : 0U),
+                std::memory_order_relaxed);
     }
-    return (answer & 1) != 0;
+    return (remembered.load(std::memory_order_relaxed) & 1) != 0;
 }
 
 std::optional<std::string> KestoReportingUtilityProcessNameForPID(std::int32_t pid)

@@ -11,7 +11,6 @@
 #include "utility/KestoReportingVocabulary.h"
 
 #include <array>
-#include <condition_variable>
 #include <cstdint>
 #include <optional>
 #include <span>
@@ -26,11 +25,12 @@ constexpr std::string_view KestoReportingHostApplicationKey = "HostApplicationDi
 // A condition variable with its own lock.
 struct KestoReportingCondition {
     foundation::Mutex lock;
-    std::condition_variable_any signal;
+    foundation::Condition signal;
 };
 
-// Waits until the other side has set the flag. Each wait without a signal lasts `timeout` seconds at most; a
-// wake-up without the flag begins a new one. False when one of them timed out.
+// Waits until the other side has set the flag. Each wait without a signal lasts `timeout` seconds at most (not at all
+// when it is negative, as good as for ever when it is no number); a wake-up without the flag begins a new one. False
+// when one of them timed out.
 bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeout, const bool& flag,
                                std::string_view waitMessage, std::string_view timeoutMessage,
                                platform::LogCategory& logCategory);

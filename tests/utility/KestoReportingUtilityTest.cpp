@@ -1,3 +1,5 @@
+// The shared functions, each with the values that its users meet and with those at the edges; where two formulations of
+// the same thing exist, against each other.
 #include "utility/KestoReportingUtility.h"
 #include "support/TestPlatform.h"
 
@@ -6,6 +8,8 @@
 #include <gtest/gtest.h>
 #include <limits>
 #include <rapidcheck/gtest.h>
+#include <thread>
+#include <vector>
 
 namespace {
 
@@ -44,6 +48,17 @@ TEST_F(InternalBuild, IsAskedForOnce)
     EXPECT_FALSE(KestoReportingUtilityIsInternalBuild());
     platform.deviceProperties.set("InternalBuild", true);
     EXPECT_FALSE(KestoReportingUtilityIsInternalBuild());
+    EXPECT_EQ(platform.deviceProperties.timesAsked("InternalBuild"), 1);
+}
+
+TEST_F(InternalBuild, IsAskedForOnceByThreadsThatMeetItTogether)
+{
+    platform.deviceProperties.set("InternalBuild", true);
+    {
+        std::vector<std::jthread> threads;
+        for (int thread = 0; thread < 4; ++thread)
+            threads.emplace_back([] { EXPECT_TRUE(KestoReportingUtilityIsInternalBuild()); });
+    }
     EXPECT_EQ(platform.deviceProperties.timesAsked("InternalBuild"), 1);
 }
 
@@ -186,6 +201,23 @@ RC_GTEST_PROP(WhiteSpace, IsRemovedAsEntryByEntryWouldRemoveIt, ())
         expected = expected.with(foundation::String(clean), value);
     }
     RC_ASSERT(KestoReportingUtilityRemoveWhiteSpaceFromKeys(message) == expected);
+}
+
+RC_GTEST_PROP(NormalisedMessage, IsWhatTheThreeStepsMakeOfIt, (bool isInternalBuild))
+{
+    support::TestPlatform platform;
+    platform.deviceProperties.setInternalBuild(isInternalBuild);
+    const auto key = rc::gen::element<std::string>("a b", "a_b", "audiotag", "audio tag", "kestoreporting timestamp",
+                                                   "kestoreporting_timestamp");
+    Dictionary::Entries entries;
+    for (const auto& [entryKey, value] :
+         *rc::gen::container<std::vector<std::pair<std::string, int>>>(rc::gen::pair(key, rc::gen::inRange(0, 9))))
+        entries.push_back({foundation::String(entryKey), value});
+    const Dictionary message(entries);
+
+    const Dictionary expected = KestoReportingUtilityRemoveEventEpochTime(
+        KestoReportingUtilityAddAudioMessageTag(KestoReportingUtilityRemoveWhiteSpaceFromKeys(message), 4, 1));
+    RC_ASSERT(Value(KestoReportingUtilityNormaliseMessage(message, 4, 1)).text() == Value(expected).text());
 }
 
 // --- numbers

@@ -6,6 +6,7 @@
 #include <chrono>
 #include <future>
 #include <gmock/gmock.h>
+#include <limits>
 #include <thread>
 
 namespace {
@@ -78,7 +79,7 @@ TEST_F(WaitTest, BeginsAnewAfterAWakeUpWithoutTheFlag)
     auto waited = std::async(std::launch::async, [this] { return wait(aMinute); });
     letItFallAsleep();
     while (platform.log.lines().size() < 3) { // "waiting for it", "continuing", "waiting for it"
-        condition.signal.notify_one();
+        condition.signal.notifyOne();
         std::this_thread::yield();
     }
     KestoReportingUtilitySignal(condition, flag);
@@ -89,6 +90,46 @@ TEST_F(WaitTest, BeginsAnewAfterAWakeUpWithoutTheFlag)
     for (std::size_t place = 0; place < lines.size(); place += 2) {
         EXPECT_THAT(lines[place], IsLine(Info, "kert", "waiting for it"));
         EXPECT_THAT(lines[place + 1], IsLine(Info, "kert", "continuing"));
+    }
+}
+
+TEST_F(WaitTest, WaitsItsWholeTimeAgainAfterAWakeUpWithoutTheFlag)
+{
+    constexpr std::chrono::milliseconds timeout(200);
+    const auto saidTwice = [this] { return platform.log.lines().size() == 4; };
+    std::chrono::steady_clock::time_point woken;
+    std::chrono::steady_clock::time_point ended;
+    for (int attempt = 0; attempt < 10 && !saidTwice();
+         ++attempt) { // on a busy machine it may give up before it is woken
+        platform.log.clear();
+        auto waited = std::async(std::launch::async, [&] {
+            EXPECT_FALSE(wait(std::chrono::duration<double>(timeout).count()));
+            ended = std::chrono::steady_clock::now();
+        });
+        letItFallAsleep();
+        waited.wait_for(timeout / 2);
+        woken = std::chrono::steady_clock::now();
+        condition.signal.notifyOne();
+        waited.get();
+    }
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Info, "kert", "waiting for it"), IsLine(Info, "kert", "continuing"),
+                            IsLine(Info, "kert", "waiting for it"), IsLine(Error, "kert", "it never came")));
+    EXPECT_GE(ended - woken, timeout);
+}
+
+TEST_F(WaitTest, TakesEveryNumberForATimeout)
+{
+    EXPECT_FALSE(wait(-1));
+    EXPECT_FALSE(wait(-std::numeric_limits<double>::infinity()));
+    for (const double endless : {std::numeric_limits<double>::infinity(), std::numeric_limits<double>::max(),
+                                 std::numeric_limits<double>::quiet_NaN()}) {
+        flag = false;
+        platform.log.clear();
+        auto waited = std::async(std::launch::async, [&] { return wait(endless); });
+        letItFallAsleep();
+        KestoReportingUtilitySignal(condition, flag);
+        EXPECT_TRUE(waited.get()) << endless;
     }
 }
 
