@@ -1,3 +1,5 @@
+// From a statement that is let through to one record: the message is formatted here, once for all statements, so that
+// each of them is a small call.
 #include "platform/Log.h"
 
 #include "platform/Platform.h"

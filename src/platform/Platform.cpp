@@ -1,8 +1,10 @@
+// What is installed, and which log categories have learnt their threshold from it.
 #include "platform/Platform.h"
+
+#include "foundation/Mutex.h"
 
 #include <atomic>
 #include <cassert>
-#include <mutex>
 #include <optional>
 #include <vector>
 
@@ -13,12 +15,12 @@ std::optional<Platform> installed;
 std::atomic<std::uint64_t> installations;
 
 // The categories that know their threshold, which is the installed log's.
-std::mutex resolvedLock;
-std::vector<LogCategory*> resolved;
+foundation::Mutex resolvedLock;
+std::vector<LogCategory*> resolved KESTO_GUARDED_BY(resolvedLock);
 
 void forgetThresholds()
 {
-    const std::scoped_lock lock(resolvedLock);
+    const foundation::Lock lock(resolvedLock);
     for (LogCategory* category : resolved)
         category->forgetThreshold();
     resolved.clear();
@@ -61,7 +63,7 @@ bool LogCategory::isEnabledOnceResolved(LogLevel level) noexcept
         return false;
     const LogLevel threshold = installed->log.threshold(*this);
     threshold_.store(static_cast<std::uint8_t>(threshold), std::memory_order_relaxed);
-    const std::scoped_lock lock(resolvedLock);
+    const foundation::Lock lock(resolvedLock);
     resolved.push_back(this);
     return level <= threshold;
 }

@@ -27,8 +27,8 @@ protected:
         install(same);
     }
 
+    LogCategory category_{subsystem, "test"}; // outlives the platform, which makes it forget its threshold
     support::TestPlatform platform_;
-    LogCategory category_{subsystem, "test"};
 };
 
 TEST_F(LogTest, ALineCarriesItsLevelTagAndText)
@@ -80,7 +80,7 @@ TEST_F(LogTest, TheThresholdIsAskedForOnceACategory)
     KESTO_LOG(category_, Debug, "dropped");
     platform_.log.setThreshold(LogLevel::Debug);
     KESTO_LOG(category_, Debug, "dropped all the same");
-    LogCategory newcomer(subsystem, "newcomer");
+    static LogCategory newcomer(subsystem, "newcomer");
     KESTO_LOG(newcomer, Debug, "kept");
     EXPECT_THAT(platform_.log.take(), ElementsAre(IsLine(LogLevel::Debug, "newcomer", "kept")));
 }
