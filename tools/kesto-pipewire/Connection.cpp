@@ -131,6 +131,37 @@ private:
     static constexpr pw_node_events events{PW_VERSION_NODE_EVENTS, hearInfo, hearParameter};
 };
 
+class BoundDevice : public Connection::Bound {
+public:
+    BoundDevice(Connection& connection, ObjectID id) : Bound(connection, id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE)
+    {
+        if (proxy_)
+            pw_node_add_listener(reinterpret_cast<pw_node*>(proxy_), &hook_, &events, this);
+    }
+
+private:
+    static void hearInfo(void* data, const pw_node_info* info)
+    {
+        auto* self = static_cast<BoundDevice*>(data);
+        if (const auto state = stateOf(info->state))
+            self->graph().setDeviceState(self->id_, *state, currentMoment());
+    }
+
+    static std::optional<DeviceState> stateOf(pw_node_state state)
+    {
+        switch (state) {
+        case PW_NODE_STATE_ERROR: return DeviceState::Error;
+        case PW_NODE_STATE_SUSPENDED: return DeviceState::Suspended;
+        case PW_NODE_STATE_IDLE: return DeviceState::Idle;
+        case PW_NODE_STATE_RUNNING: return DeviceState::Running;
+        case PW_NODE_STATE_CREATING: break;
+        }
+        return std::nullopt;
+    }
+
+    static constexpr pw_node_events events{PW_VERSION_NODE_EVENTS, hearInfo, nullptr};
+};
+
 class BoundProfiler : public Connection::Bound {
 public:
     BoundProfiler(Connection& connection, ObjectID id)
@@ -144,7 +175,7 @@ private:
     static void hearProfile(void* data, const spa_pod* profile)
     {
         auto& graph = static_cast<BoundProfiler*>(data)->graph();
-        readLateCycles(*profile, [&graph](ObjectID node, std::int64_t began) { graph.noteLateCycle(node, began); });
+        readCycles(*profile, [&graph](const Cycle& cycle) { graph.noteCycle(cycle); });
     }
 
     static constexpr pw_profiler_events events{PW_VERSION_PROFILER_EVENTS, hearProfile};
@@ -237,8 +268,11 @@ void Connection::nodeAppeared(ObjectID id, const spa_dict& properties)
         .name = textOf(properties, PW_KEY_NODE_NAME),
         .client = numberOf<ObjectID>(properties, PW_KEY_CLIENT_ID),
     };
-    if (graph_.addNode(id, node))
-        bound_[id] = std::make_unique<BoundStream>(*this, id);
+    switch (graph_.addNode(id, node)) {
+    case Graph::Interest::Stream: bound_[id] = std::make_unique<BoundStream>(*this, id); break;
+    case Graph::Interest::Device: bound_[id] = std::make_unique<BoundDevice>(*this, id); break;
+    case Graph::Interest::None: break;
+    }
 }
 
 void Connection::objectRemoved(ObjectID id)

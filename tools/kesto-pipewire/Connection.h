@@ -1,7 +1,7 @@
 // One connection to a PipeWire server: its events, decoded and fed into a graph of streams.
 //
-// It only ever looks. It binds clients (for who they are), streams (for their state, volume and format) and,
-// while a stream runs, the profiler (for late cycles); links and devices are told by the registry itself.
+// It only ever looks. It binds clients (for who they are), streams (for their state, volume and format), devices (for
+// their state) and, while a stream runs, the profiler (for cycles); links are told by the registry itself.
 #pragma once
 
 #include "kesto-pipewire/Graph.h"

@@ -2,6 +2,7 @@
 
 #include "kesto-pipewire/Text.h"
 
+#include <algorithm>
 #include <set>
 
 namespace kesto_pipewire {
@@ -19,6 +20,16 @@ std::optional<Direction> directionOfClass(std::string_view mediaClass)
     return std::nullopt;
 }
 
+// What takes sound and gives it counts by what it takes.
+std::optional<Direction> directionOfDevice(std::string_view mediaClass)
+{
+    if (mediaClass == "Audio/Sink" || mediaClass == "Audio/Duplex")
+        return Direction::Output;
+    if (mediaClass == "Audio/Source")
+        return Direction::Input;
+    return std::nullopt;
+}
+
 } // namespace
 
 bool Graph::hasRoom(std::size_t count, std::size_t maximum)
@@ -29,16 +40,27 @@ bool Graph::hasRoom(std::size_t count, std::size_t maximum)
     return false;
 }
 
-bool Graph::addNode(ObjectID node, const NodeAnnouncement& announcement)
+Graph::Interest Graph::addNode(ObjectID id, const NodeAnnouncement& announcement)
 {
     const auto direction = directionOfClass(announcement.mediaClass);
+    const auto device = directionOfDevice(announcement.mediaClass);
     if (!hasRoom(nodes_.size(), maximumObjects) || (direction && !hasRoom(streams_, maximumStreams)))
-        return false;
-    const auto isNew =
-        nodes_.try_emplace(node, Node{announcement.serial, tidyText(announcement.name), direction, announcement.client})
-            .second;
-    streams_ += isNew && direction;
-    return isNew && direction;
+        return Interest::None;
+    const auto [place, isNew] = nodes_.try_emplace(
+        id, Node{announcement.serial, tidyText(announcement.name), direction, false, announcement.client});
+    auto& node = place->second;
+    if (!isNew || (!direction && !device))
+        return Interest::None;
+    if (direction) {
+        ++streams_;
+        return Interest::Stream;
+    }
+    if (!hasRoom(devices_, maximumDevices)) // it still has a name, which streams are told
+        return Interest::None;
+    ++devices_;
+    node.isDevice = true;
+    deviceListener_.deviceAppeared(node.serial, {*device, node.name});
+    return Interest::Device;
 }
 
 void Graph::addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Moment when)
@@ -46,15 +68,19 @@ void Graph::addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Mome
     if (!hasRoom(links_.size(), maximumObjects))
         return;
     links_[link] = {outputNode, inputNode};
-    tellDevices(outputNode, when);
-    tellDevices(inputNode, when);
+    for (const auto node : {outputNode, inputNode}) {
+        tellDevices(node, when);
+        tellWanted(node, when);
+    }
 }
 
 void Graph::remove(ObjectID object, Moment when)
 {
     if (const auto link = links_.extract(object)) {
-        tellDevices(link.mapped().outputNode, when);
-        tellDevices(link.mapped().inputNode, when);
+        for (const auto node : {link.mapped().outputNode, link.mapped().inputNode}) {
+            tellDevices(node, when);
+            tellWanted(node, when);
+        }
     }
     removeNode(object, when);
     clients_.erase(object);
@@ -67,9 +93,12 @@ void Graph::removeNode(ObjectID id, Moment when)
         return;
     const auto& node = removed.mapped();
     streams_ -= node.direction.has_value();
+    devices_ -= node.isDevice;
     runningStreams_ -= node.isRunning;
     if (node.hasAppeared)
         listener_.gone(node.serial, when);
+    if (node.isDevice)
+        deviceListener_.deviceGone(node.serial);
 
     // Links go before their nodes; one that did not must not tie the ID's next owner to this one's partners.
     std::erase_if(links_, [id](const auto& link) { return link.second.touches(id); });
@@ -77,13 +106,16 @@ void Graph::removeNode(ObjectID id, Moment when)
 
 void Graph::clear(Moment when)
 {
-    for (const auto& [id, node] : nodes_)
+    for (const auto& [id, node] : nodes_) {
         if (node.hasAppeared)
             listener_.gone(node.serial, when);
+        if (node.isDevice)
+            deviceListener_.deviceGone(node.serial);
+    }
     nodes_.clear();
     links_.clear();
     clients_.clear();
-    streams_ = runningStreams_ = 0;
+    streams_ = devices_ = runningStreams_ = 0;
 }
 
 void Graph::describeClient(ObjectID client, Identity identity)
@@ -142,6 +174,22 @@ void Graph::setFormat(ObjectID id, const StreamFormat& format, Moment when)
         listener_.formatChanged(node->serial, format, when);
 }
 
+void Graph::setDeviceState(ObjectID id, DeviceState state, Moment when)
+{
+    if (const auto found = nodes_.find(id); found != nodes_.end() && found->second.isDevice)
+        deviceListener_.deviceStateChanged(found->second.serial, state, when);
+}
+
+void Graph::noteCycle(const Cycle& cycle)
+{
+    for (const auto& part : cycle.nodes) {
+        if (part.isLate)
+            noteLateCycle(part.node, cycle.began);
+        if (const auto found = nodes_.find(part.node); found != nodes_.end() && found->second.isDevice)
+            deviceListener_.deviceCycle(found->second.serial, part);
+    }
+}
+
 void Graph::noteLateCycle(ObjectID id, std::int64_t began)
 {
     auto* node = appearedStream(id);
@@ -163,6 +211,15 @@ std::string Graph::devicesOf(ObjectID id) const
     for (const auto name : names)
         devices.append(devices.empty() ? "" : ",").append(name);
     return tidyText(devices, maximumDevicesBytes);
+}
+
+void Graph::tellWanted(ObjectID id, Moment when)
+{
+    const auto found = nodes_.find(id);
+    if (found == nodes_.end() || !found->second.isDevice)
+        return;
+    const auto touches = [id](const auto& link) { return link.second.touches(id); };
+    deviceListener_.deviceWanted(found->second.serial, std::ranges::any_of(links_, touches), when);
 }
 
 void Graph::tellDevices(ObjectID id, Moment when)

@@ -1,10 +1,12 @@
-// The part of PipeWire's object graph that concerns streams: who plays, on whose behalf, linked with what.
+// The part of PipeWire's object graph that concerns sound: who plays, on whose behalf, linked with what, and what the
+// devices do.
 //
 // The server tells of objects one by one, under IDs that it uses again at once. This keeps just enough of
-// them to turn those tellings into changes of streams. It is plain data and knows nothing of libpipewire,
+// them to turn those tellings into changes of streams and devices. It is plain data and knows nothing of libpipewire,
 // so that every order of events can be tried without a server. All of it on one thread.
 #pragma once
 
+#include "kesto-pipewire/Device.h"
 #include "kesto-pipewire/Stream.h"
 
 #include <cstddef>
@@ -17,9 +19,8 @@ namespace kesto_pipewire {
 
 // Any client of PipeWire can make objects; beyond these numbers they are left aside and counted.
 constexpr std::size_t maximumStreams = 512;
+constexpr std::size_t maximumDevices = 128;
 constexpr std::size_t maximumObjects = 16384; // of each kind
-
-using ObjectID = std::uint32_t;
 
 // Who a program says it is, on its client object, its node or both.
 struct Identity {
@@ -38,10 +39,15 @@ struct NodeAnnouncement {
 
 class Graph {
 public:
-    explicit Graph(StreamListener& listener) : listener_(listener) { }
+    Graph(StreamListener& listener, DeviceListener& deviceListener)
+        : listener_(listener),
+          deviceListener_(deviceListener)
+    {
+    }
 
-    // Answers whether the node is a stream whose further events are wanted.
-    [[nodiscard]] bool addNode(ObjectID node, const NodeAnnouncement& announcement);
+    // What the further events of a node are wanted for.
+    enum class Interest : std::uint8_t { None, Stream, Device };
+    [[nodiscard]] Interest addNode(ObjectID node, const NodeAnnouncement& announcement);
     void addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Moment when);
     // An object of any kind is gone.
     void remove(ObjectID object, Moment when);
@@ -56,6 +62,10 @@ public:
     void setRunning(ObjectID node, bool running, Moment when);
     void setVolume(ObjectID node, double volume, Moment when);
     void setFormat(ObjectID node, const StreamFormat& format, Moment when);
+    // Of nodes that are no devices it is ignored.
+    void setDeviceState(ObjectID node, DeviceState state, Moment when);
+    // Tells the devices of their cycles and the streams of those that they were late in.
+    void noteCycle(const Cycle& cycle);
     // A node was late in the cycle that began then, in nanoseconds of CLOCK_MONOTONIC; repeated for one cycle, it
     // counts once. It is told in arrears: the ID may be another node's by now, whose cycles began later.
     void noteLateCycle(ObjectID node, std::int64_t began);
@@ -69,6 +79,7 @@ private:
         StreamSerial serial = 0;
         std::string name;
         std::optional<Direction> direction; // of streams
+        bool isDevice = false;
         std::optional<ObjectID> client;
         bool hasAppeared = false;
         bool isRunning = false;
@@ -85,13 +96,16 @@ private:
     [[nodiscard]] std::string applicationOf(const Node& node, const Identity& own) const;
     [[nodiscard]] std::string devicesOf(ObjectID node) const;
     void tellDevices(ObjectID node, Moment when);
+    void tellWanted(ObjectID node, Moment when);
     void removeNode(ObjectID node, Moment when);
 
     StreamListener& listener_;
+    DeviceListener& deviceListener_;
     std::unordered_map<ObjectID, Node> nodes_;
     std::unordered_map<ObjectID, Link> links_;
     std::unordered_map<ObjectID, Identity> clients_;
     std::size_t streams_ = 0;
+    std::size_t devices_ = 0;
     std::size_t runningStreams_ = 0;
     std::uint64_t ignoredObjects_ = 0;
 };

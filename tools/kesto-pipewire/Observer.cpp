@@ -45,11 +45,12 @@ void Observer::Release::operator()(pw_context* context) const noexcept
     pw_context_destroy(context);
 }
 
-Observer::Observer(Loop& loop, std::string remote, StreamListener& listener, const Diagnostics& diagnostics)
+Observer::Observer(Loop& loop, std::string remote, StreamListener& listener, DeviceListener& deviceListener,
+                   const Diagnostics& diagnostics)
     : loop_(loop),
       remote_(std::move(remote)),
       diagnostics_(diagnostics),
-      graph_(listener),
+      graph_(listener, deviceListener),
       retry_(loop.addTimer([this] { connect(); })),
       loss_(loop.addWakeup([this] { serverWasLost(); })),
       pause_(firstPause)

@@ -1,4 +1,4 @@
-// Keeps a connection to PipeWire and tells what happens to its streams, whatever happens to the server.
+// Keeps a connection to PipeWire and tells what happens to its streams and devices, whatever happens to the server.
 //
 // When the server goes, every stream goes with it, and the observer waits for the next one: the appearance
 // of its socket wakes it at once, a timer with growing pauses covers what that misses.
@@ -19,12 +19,13 @@ struct pw_context;
 
 namespace kesto_pipewire {
 
-// All of it on the loop's thread. The loop, the listener and the diagnostics outlive it.
+// All of it on the loop's thread. The loop, the listeners and the diagnostics outlive it.
 class Observer {
 public:
     // `remote` is a server's name or its socket's path; empty means what PipeWire's programs use by default.
     // Throws std::system_error when PipeWire's library cannot be set up.
-    Observer(Loop& loop, std::string remote, StreamListener& listener, const Diagnostics& diagnostics);
+    Observer(Loop& loop, std::string remote, StreamListener& listener, DeviceListener& deviceListener,
+             const Diagnostics& diagnostics);
     ~Observer();
     Observer(const Observer&) = delete;
     Observer& operator=(const Observer&) = delete;

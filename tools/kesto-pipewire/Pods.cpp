@@ -69,28 +69,28 @@ std::string shortName(const spa_type_info* types, std::uint32_t type)
 }
 
 // One node's part of a cycle: its ID, its name, four times and how far it came.
-struct FollowerBlock {
-    std::int32_t node = 0;
-    std::int32_t status = cycleFinished;
-};
-
-std::optional<FollowerBlock> readFollower(const spa_pod& block)
+std::optional<NodeCycle> readNodeCycle(const spa_pod& block)
 {
     spa_pod_parser parser;
     spa_pod_frame frame;
-    FollowerBlock follower;
+    std::int32_t node = 0;
     const char* name = nullptr;
-    std::int64_t time = 0;
+    std::array<std::int64_t, 4> times{}; // the signal before, the signal, awake, finish
+    std::int32_t status = 0;
     spa_pod_parser_pod(&parser, &block);
-    if (spa_pod_parser_push_struct(&parser, &frame) < 0 || spa_pod_parser_get_int(&parser, &follower.node) < 0
+    if (spa_pod_parser_push_struct(&parser, &frame) < 0 || spa_pod_parser_get_int(&parser, &node) < 0
         || spa_pod_parser_get_string(&parser, &name) < 0)
         return std::nullopt;
-    for (int count = 0; count < 4; ++count)
+    for (auto& time : times)
         if (spa_pod_parser_get_long(&parser, &time) < 0)
             return std::nullopt;
-    if (spa_pod_parser_get_int(&parser, &follower.status) < 0)
+    if (spa_pod_parser_get_int(&parser, &status) < 0)
         return std::nullopt;
-    return follower;
+    NodeCycle cycle{.node = static_cast<ObjectID>(node), .isLate = status != cycleFinished};
+    const auto [signalBefore, signal, awake, finish] = times;
+    if (awake > 0 && finish >= awake) // of a node that has not finished they are the cycle's before
+        cycle.workNanoseconds = finish - awake;
+    return cycle;
 }
 
 // The clock's flags, ID and name, and then when the cycle began.
@@ -166,22 +166,33 @@ std::optional<StreamFormat> readFormat(const spa_pod& format)
     return result;
 }
 
-void readLateCycles(const spa_pod& profile, const std::function<void(std::uint32_t, std::int64_t)>& tell)
+void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& tell)
 {
     if (!spa_pod_is_struct(&profile))
         return;
-    forEachMember(profile, [&](const spa_pod& cycle) {
-        if (!spa_pod_is_object_type(&cycle, SPA_TYPE_OBJECT_Profiler))
+    forEachMember(profile, [&](const spa_pod& object) {
+        if (!spa_pod_is_object_type(&object, SPA_TYPE_OBJECT_Profiler))
             return;
-        std::optional<std::int64_t> began; // the clock stands before the followers
-        forEachProperty(cycle, [&](std::uint32_t key, const spa_pod& value) {
+        Cycle cycle;
+        std::optional<std::int64_t> began;
+        std::optional<NodeCycle> driver;
+        forEachProperty(object, [&](std::uint32_t key, const spa_pod& value) {
             if (key == SPA_PROFILER_clock)
                 began = readCycleBegin(value);
-            if (key != SPA_PROFILER_followerBlock || !began)
-                return;
-            if (const auto follower = readFollower(value); follower && follower->status != cycleFinished)
-                tell(static_cast<std::uint32_t>(follower->node), *began);
+            else if (key == SPA_PROFILER_driverBlock)
+                driver = readNodeCycle(value);
+            else if (key == SPA_PROFILER_followerBlock)
+                if (const auto follower = readNodeCycle(value))
+                    cycle.nodes.push_back(*follower);
         });
+        if (!began)
+            return;
+        cycle.began = *began;
+        if (driver) { // whose own status is that of a cycle which is just being told
+            driver->isLate = std::ranges::any_of(cycle.nodes, &NodeCycle::isLate);
+            cycle.nodes.push_back(*driver);
+        }
+        tell(cycle);
     });
 }
 

@@ -1,6 +1,7 @@
-// Reading of what PipeWire says in its own binary values ("pods"): volumes, formats and late cycles.
+// Reading of what PipeWire says in its own binary values ("pods"): volumes, formats and cycles.
 #pragma once
 
+#include "kesto-pipewire/Device.h"
 #include "kesto-pipewire/Stream.h"
 
 #include <cstdint>
@@ -22,8 +23,7 @@ namespace kesto_pipewire {
 // The audio format, or nothing when the value holds none, as when the stream is suspended. Any thread.
 [[nodiscard]] std::optional<StreamFormat> readFormat(const spa_pod& format);
 
-// Calls back for every node that was not ready in its cycle, with its object ID and when the cycle began, in
-// nanoseconds of CLOCK_MONOTONIC. Any thread.
-void readLateCycles(const spa_pod& profile, const std::function<void(std::uint32_t node, std::int64_t began)>& tell);
+// Calls back for every cycle that the profiler tells of. Any thread.
+void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& tell);
 
 } // namespace kesto_pipewire

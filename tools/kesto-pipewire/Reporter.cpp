@@ -66,9 +66,10 @@ Category Reporter::Stream::category() const
     return description.direction == Direction::Output ? Category::Playback : Category::Record;
 }
 
-Reporter::Reporter(ReportingService& service, ReporterID firstID, Alarm alarm)
+Reporter::Reporter(ReportingService& service, ReporterID firstID, Alarm alarm, BeforeSampling beforeSampling)
     : service_(service),
       alarm_(std::move(alarm)),
+      beforeSampling_(std::move(beforeSampling)),
       nextID_(firstID)
 {
 }
@@ -321,6 +322,7 @@ void Reporter::openSession(const Stream& stream)
     service_.setServiceType(stream.session, serviceTypeOfRole(stream.description.role));
     if (!stream.description.application.empty())
         service_.setConfiguration(stream.session, {{"HostApplicationDisplayID", stream.description.application}});
+    beforeSampling_();
     service_.start(stream.session);
 }
 
@@ -330,6 +332,7 @@ void Reporter::closeSession(const Stream& stream, Moment when)
          {{"session_duration", roundedToMilliseconds(when.uptime - stream.appearedAt.uptime)}}, when);
     if (!serviceIsThere_)
         return;
+    beforeSampling_();
     service_.stop(stream.session);
     service_.destroy(stream.session);
 }

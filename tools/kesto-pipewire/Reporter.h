@@ -33,9 +33,11 @@ class Reporter : public StreamListener {
 public:
     // Tells when `settle` is to be called next, as an uptime; nothing means not before something happens.
     using Alarm = std::function<void(std::optional<double> uptime)>;
+    // Called before a session starts or ends, when the service samples what the devices have done.
+    using BeforeSampling = std::function<void()>;
 
     // Sessions get the IDs from `firstID` upwards, which is greater than 0. The service outlives this.
-    Reporter(ReportingService& service, ReporterID firstID, Alarm alarm);
+    Reporter(ReportingService& service, ReporterID firstID, Alarm alarm, BeforeSampling beforeSampling = [] { });
 
     // The service can be reached from now on and knows nothing: every stream gets a session that begins with
     // the state it is in. Without a service, streams are followed and nothing is reported.
@@ -132,6 +134,7 @@ private:
 
     ReportingService& service_;
     Alarm alarm_;
+    BeforeSampling beforeSampling_;
     ReporterID nextID_;
     bool serviceIsThere_ = false;
     std::optional<double> alarmTime_;

@@ -1,10 +1,11 @@
 // kesto-pipewire: reports every stream of a running PipeWire to the reporting service, so that nothing needs
 // to be changed in any player.
 //
-// Here the three parts meet: the observer, which speaks PipeWire; the reporter, which decides what is
-// told; and the connection to the service. The program runs until a signal ends it and then ends every
-// session; it outlives both servers and waits for whichever is away.
+// Here the parts meet: the observer, which speaks PipeWire; the reporter, which decides what is told; the connection to
+// the service; and the channels, which the service reads by itself. The program runs until a signal ends it and then
+// ends every session; it outlives both servers and waits for whichever is away.
 
+#include "kesto-pipewire/DeviceChannels.h"
 #include "kesto-pipewire/Diagnostics.h"
 #include "kesto-pipewire/Loop.h"
 #include "kesto-pipewire/Observer.h"
@@ -31,6 +32,7 @@ constexpr int exitUndelivered = 1;
 struct Options {
     std::string socket;
     std::string remote;
+    std::string channels;
     bool verbose = false;
 };
 
@@ -65,16 +67,19 @@ int run(const Options& options)
     const auto terminate = loop.addSignal(SIGTERM, end);
     const auto interrupt = loop.addSignal(SIGINT, end);
 
+    // Before the service is reached: where it is started by that, it finds the channels.
+    DeviceChannels channels(options.channels, diagnostics);
     ServiceConnection service(loop, options.socket, diagnostics);
     Source alarm;
-    Reporter reporter(service, firstReporterID(), [&](std::optional<double> uptime) {
+    const auto setAlarm = [&](std::optional<double> uptime) {
         if (uptime)
             loop.arm(alarm, *uptime - currentMoment().uptime);
         else
             loop.disarm(alarm);
-    });
+    };
+    Reporter reporter(service, firstReporterID(), setAlarm, [&channels] { channels.flush(); });
     alarm = loop.addTimer([&reporter] { reporter.settle(currentMoment()); });
-    Observer observer(loop, options.remote, reporter, diagnostics);
+    Observer observer(loop, options.remote, reporter, channels, diagnostics);
 
     service.open(
         {.appeared = [&reporter] { reporter.serviceAppeared(); }, .lost = [&reporter] { reporter.serviceLost(); }});
@@ -94,6 +99,8 @@ int main(int argumentCount, char** arguments)
     CLI::App app("Reports every stream of a running PipeWire to the Kesto reporting service.", "kesto-pipewire");
     app.add_option("--socket", options.socket, "Socket of the reporting service")->type_name("PATH");
     app.add_option("--remote", options.remote, "Name or socket of the PipeWire server")->type_name("NAME");
+    app.add_option("--channels", options.channels, "Root of the channel tree, for the statistics of devices")
+        ->type_name("PATH");
     app.add_flag("--verbose", options.verbose, "Say everything that is reported");
     app.set_version_flag("--version", std::string("kesto-pipewire ") + kesto_version());
     try {

@@ -59,14 +59,16 @@ protected:
                                                                  {"LOGS_DIRECTORY", directory / "logs"},
                                                                  {"CONFIGURATION_DIRECTORY", directory / "config"},
                                                                  {"KESTO_SERVICE_NAME", "service"},
+                                                                 {"KESTO_CHANNEL_ROOT", directory / "channels"},
                                                                  {"KESTO_LOG", "error"}});
     }
     void startReporter()
     {
-        reporter = std::make_unique<Program>(
-            std::vector<std::string>{"sh", "-c", "exec \"$0\" \"$@\" 2>&1", KESTO_PIPEWIRE, "--socket",
-                                     directory / "run/service", "--remote", server.socket()},
-            Program::Environment{});
+        reporter =
+            std::make_unique<Program>(std::vector<std::string>{"sh", "-c", "exec \"$0\" \"$@\" 2>&1", KESTO_PIPEWIRE,
+                                                               "--socket", directory / "run/service", "--remote",
+                                                               server.socket(), "--channels", directory / "channels"},
+                                      Program::Environment{});
     }
     // Reads what the reporter says until it says that.
     [[nodiscard]] bool reporterSays(const std::string& what) const
@@ -247,6 +249,31 @@ TEST_F(EndToEndTest, TwoStreamsAtOnceDoNotMix)
     EXPECT_THAT(values("longformaudio.Volume.Summary", "PomoSessionVolume"), ElementsAre("0.5"));
     EXPECT_THAT(values("nonlongformaudio.Volume.Summary", "HostApplicationDisplayID"), ElementsAre("tone-player"));
     EXPECT_THAT(values("nonlongformaudio.Volume.Summary", "PomoSessionVolume"), ElementsAre("1"));
+}
+
+TEST_F(EndToEndTest, ASessionsEndTellsWhatTheDevicesDid)
+{
+    ASSERT_TRUE(reporterSays("connected to the reporting service"));
+    killService(); // the next one finds channels in every group
+    startService();
+    {
+        const auto player = server.playTone("Music");
+        ASSERT_TRUE(comes("kesto.Playback.Start"));
+        letItPlay(2500ms); // the profiler tells about once a second
+    }
+    ASSERT_TRUE(comes("kesto.Cavlet.State"));
+    ASSERT_TRUE(comes("kesto.Cavlet.Simple"));
+    ASSERT_TRUE(comes("kesto.Cavlet.Histogram"));
+
+    const auto cycles = values("kesto.Cavlet.Simple", "pipewire_Tx_nullsink_Simple_cycles");
+    EXPECT_GT(std::stoi(cycles.at(0)), 20);
+    EXPECT_EQ(values("kesto.Cavlet.Simple", "pipewire_Tx_Simple_cycles"), cycles);
+    EXPECT_THAT(values("kesto.Cavlet.Histogram", "pipewire_Tx_nullsink_Histogram_work"),
+                ElementsAre(testing::HasSubstr("unit=us::")));
+    EXPECT_THAT(values("kesto.Cavlet.Histogram", "pipewire_StateTransitionTimesms_nullsink_Histogram_toRunning"),
+                ElementsAre(testing::HasSubstr("unit=ms::")));
+    EXPECT_THAT(values("kesto.Cavlet.State", "pipewire_Speaker_nullsink_State_state"),
+                ElementsAre(testing::HasSubstr("name:Running,transition:1,")));
 }
 
 TEST_F(EndToEndTest, AServiceThatIsKilledIsToldTheStateAgainWhenItIsBack)

@@ -1,6 +1,7 @@
 // The graph of streams, fed with every order of events that a server may tell them in.
 
 #include "kesto-pipewire/Graph.h"
+#include "tools/pipewire/RecordingDevices.h"
 #include "tools/pipewire/RecordingListener.h"
 
 #include <gmock/gmock.h>
@@ -19,40 +20,91 @@ constexpr ObjectID link = 50;
 
 class GraphTest : public testing::Test {
 protected:
-    GraphTest() { EXPECT_FALSE(add(sink, 30, "speaker", "Audio/Sink")); }
+    GraphTest() { EXPECT_EQ(add(sink, 30, "speaker", "Audio/Sink"), Interest::Device); }
 
-    [[nodiscard]] bool add(ObjectID id, StreamSerial serial, std::string_view name = "player",
-                           std::string_view mediaClass = "Stream/Output/Audio")
+    using Interest = Graph::Interest;
+
+    [[nodiscard]] Interest add(ObjectID id, StreamSerial serial, std::string_view name = "player",
+                               std::string_view mediaClass = "Stream/Output/Audio")
     {
         return graph.addNode(id, {.serial = serial, .mediaClass = mediaClass, .name = name});
     }
     void addStream(ObjectID id, StreamSerial serial, std::string_view name = "player",
                    std::string_view mediaClass = "Stream/Output/Audio")
     {
-        ASSERT_TRUE(add(id, serial, name, mediaClass));
+        ASSERT_EQ(add(id, serial, name, mediaClass), Interest::Stream);
         graph.describeNode(id, {.binary = "player"}, "Music", now);
         listener.news();
     }
 
     Moment now{1000, 10};
     RecordingListener listener;
-    Graph graph{listener};
+    RecordingDevices devices;
+    Graph graph{listener, devices};
 };
 
-TEST_F(GraphTest, OnlyStreamsOfAudioAreWanted)
+TEST_F(GraphTest, OnlyStreamsAndDevicesOfAudioAreWanted)
 {
-    EXPECT_TRUE(add(1, 1, "a", "Stream/Output/Audio"));
-    EXPECT_TRUE(add(2, 2, "b", "Stream/Input/Audio"));
-    EXPECT_FALSE(add(3, 3, "c", "Audio/Sink"));
-    EXPECT_FALSE(add(4, 4, "d", "Audio/Source"));
-    EXPECT_FALSE(add(5, 5, "e", "Stream/Input/Video"));
-    EXPECT_FALSE(add(6, 6, "f", "Midi/Bridge"));
-    EXPECT_FALSE(add(7, 7, "g", ""));
+    EXPECT_EQ(add(1, 1, "a", "Stream/Output/Audio"), Interest::Stream);
+    EXPECT_EQ(add(2, 2, "b", "Stream/Input/Audio"), Interest::Stream);
+    EXPECT_EQ(add(3, 3, "c", "Audio/Sink"), Interest::Device);
+    EXPECT_EQ(add(4, 4, "d", "Audio/Source"), Interest::Device);
+    EXPECT_EQ(add(5, 5, "e", "Audio/Duplex"), Interest::Device);
+    EXPECT_EQ(add(6, 6, "f", "Stream/Input/Video"), Interest::None);
+    EXPECT_EQ(add(7, 7, "g", "Midi/Bridge"), Interest::None);
+    EXPECT_EQ(add(8, 8, "h", ""), Interest::None);
+    EXPECT_EQ(add(1, 9, "a node is announced once", "Stream/Output/Audio"), Interest::None);
+
+    EXPECT_THAT(devices.news(), ElementsAre("30 output speaker", "3 output c", "4 input d", "5 output e"));
+}
+
+TEST_F(GraphTest, ADevicesStateAndLinksAreTold)
+{
+    addStream(node, 500);
+    devices.news();
+    graph.setDeviceState(sink, DeviceState::Idle, now);
+    graph.addLink(50, node, sink, now);
+    graph.addLink(51, node, sink, now);
+    graph.setDeviceState(sink, DeviceState::Running, now);
+    graph.remove(50, now);
+    graph.remove(51, now);
+    graph.remove(sink, now);
+    graph.setDeviceState(sink, DeviceState::Idle, now);
+
+    EXPECT_THAT(devices.news(),
+                ElementsAre("30 idle", "30 wanted", "30 wanted", "30 running", "30 wanted", "30 unwanted", "30 gone"));
+}
+
+TEST_F(GraphTest, ACycleIsToldToItsDevicesAndToTheStreamsThatWereLate)
+{
+    addStream(40, 500);
+    addStream(41, 501);
+    devices.news();
+    graph.noteCycle(
+        {.began = 1000, .nodes = {{.node = 40}, {.node = 41, .isLate = true}, {.node = sink, .isLate = true}}});
+    graph.noteCycle({.began = 2000, .nodes = {{.node = 40}, {.node = 99, .isLate = true}, {.node = sink}}});
+
+    EXPECT_THAT(listener.news(), ElementsAre("501 late"));
+    EXPECT_THAT(devices.news(), ElementsAre("30 late cycle", "30 cycle"));
+}
+
+TEST_F(GraphTest, DevicesBeyondTheLimitKeepTheirNamesOnly)
+{
+    for (ObjectID id = 1; id < maximumDevices; ++id)
+        ASSERT_EQ(add(1000 + id, 1000 + id, "device", "Audio/Sink"), Interest::Device);
+    EXPECT_EQ(add(31, 31, "headset", "Audio/Sink"), Interest::None);
+    EXPECT_EQ(graph.ignoredObjects(), 1u);
+    addStream(node, 500);
+    graph.addLink(link, node, 31, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'headset'"));
+    graph.remove(1001, now);
+
+    EXPECT_EQ(add(32, 32, "another", "Audio/Sink"), Interest::Device);
 }
 
 TEST_F(GraphTest, AStreamAppearsWhenItIsDescribedAndOnlyOnce)
 {
-    ASSERT_TRUE(add(node, 500));
+    ASSERT_EQ(add(node, 500), Interest::Stream);
     EXPECT_THAT(listener.news(), IsEmpty());
     graph.describeNode(node, {.name = "Player"}, "Music", now);
     graph.describeNode(node, {.name = "Player"}, "Music", now);
@@ -84,8 +136,9 @@ TEST_F(GraphTest, TheApplicationIsItsIDElseItsBinaryElseItsNameWhoeverSaysSo)
     StreamSerial serial = 1000;
     for (const auto& [onNode, onClient, application] : cases) {
         graph.describeClient(7, onClient);
-        ASSERT_TRUE(
-            graph.addNode(node, {.serial = ++serial, .mediaClass = "Stream/Output/Audio", .name = "n", .client = 7}));
+        ASSERT_EQ(
+            graph.addNode(node, {.serial = ++serial, .mediaClass = "Stream/Output/Audio", .name = "n", .client = 7}),
+            Interest::Stream);
         graph.describeNode(node, onNode, "", now);
         EXPECT_EQ(listener.news().front(), fmt::format("{} appeared output role= application={}", serial, application));
         graph.remove(node, now);
@@ -96,7 +149,7 @@ TEST_F(GraphTest, TheApplicationIsItsIDElseItsBinaryElseItsNameWhoeverSaysSo)
 TEST_F(GraphTest, DevicesAreNamedOnceHoweverManyLinksThereAre)
 {
     addStream(node, 500);
-    EXPECT_FALSE(add(31, 31, "another", "Audio/Sink"));
+    EXPECT_EQ(add(31, 31, "another", "Audio/Sink"), Interest::Device);
     graph.addLink(50, node, sink, now);
     graph.addLink(51, node, sink, now);
     graph.addLink(52, node, 31, now);
@@ -127,7 +180,7 @@ TEST_F(GraphTest, StreamsThatAreLinkedWithEachOtherAreEachOthersDevices)
 
 TEST_F(GraphTest, WhoComesLateLearnsOfLinksThatAreThere)
 {
-    ASSERT_TRUE(add(node, 500));
+    ASSERT_EQ(add(node, 500), Interest::Stream);
     graph.addLink(link, node, sink, now);
     EXPECT_THAT(listener.news(), IsEmpty());
     graph.describeNode(node, {}, "", now);
@@ -142,7 +195,7 @@ TEST_F(GraphTest, AnIDThatIsUsedAgainIsAnotherStream)
     graph.addLink(link, node, sink, now);
     graph.remove(node, now); // before its link, which servers do not do
     listener.news();
-    ASSERT_TRUE(add(node, 501));
+    ASSERT_EQ(add(node, 501), Interest::Stream);
     graph.describeNode(node, {}, "", now);
     graph.setRunning(node, true, now);
 
@@ -199,12 +252,13 @@ TEST_F(GraphTest, WhenTheServerGoesEveryStreamGoes)
 {
     addStream(40, 500);
     addStream(41, 501);
-    ASSERT_TRUE(add(42, 502)); // not described yet
+    ASSERT_EQ(add(42, 502), Interest::Stream); // not described yet
     graph.setRunning(40, true, now);
     listener.news();
     graph.clear(now);
 
     EXPECT_THAT(listener.news(), testing::UnorderedElementsAre("500 gone", "501 gone"));
+    EXPECT_THAT(devices.news(), ElementsAre("30 output speaker", "30 gone"));
     EXPECT_FALSE(graph.anyStreamRuns());
     graph.addLink(link, 40, 41, now);
     graph.setRunning(41, true, now);
@@ -214,20 +268,20 @@ TEST_F(GraphTest, WhenTheServerGoesEveryStreamGoes)
 TEST_F(GraphTest, StreamsBeyondTheLimitAreLeftAsideAndCounted)
 {
     for (ObjectID id = 0; id < maximumStreams; ++id)
-        ASSERT_TRUE(add(1000 + id, 1000 + id));
-    EXPECT_FALSE(add(node, 500));
+        ASSERT_EQ(add(1000 + id, 1000 + id), Interest::Stream);
+    EXPECT_EQ(add(node, 500), Interest::None);
     EXPECT_EQ(graph.ignoredObjects(), 1u);
     graph.describeNode(node, {}, "", now);
     EXPECT_THAT(listener.news(), IsEmpty());
     graph.remove(1000, now);
 
-    EXPECT_TRUE(add(node, 501));
+    EXPECT_EQ(add(node, 501), Interest::Stream);
 }
 
 TEST_F(GraphTest, ObjectsOfEveryOtherKindHaveTheirLimitToo)
 {
     for (ObjectID id = 0; id < maximumObjects + 10; ++id) {
-        EXPECT_FALSE(add(100'000 + id, id, "device", "Audio/Sink"));
+        EXPECT_EQ(add(100'000 + id, id, "device", "Audio/Card"), Interest::None);
         graph.addLink(200'000 + id, sink, sink, now);
         graph.describeClient(300'000 + id, {});
     }
@@ -237,8 +291,8 @@ TEST_F(GraphTest, ObjectsOfEveryOtherKindHaveTheirLimitToo)
 
 TEST_F(GraphTest, ForeignTextIsMadeFitToBeSent)
 {
-    EXPECT_FALSE(add(31, 31, "bad\xFF\xFEname", "Audio/Sink"));
-    ASSERT_TRUE(add(node, 500));
+    EXPECT_EQ(add(31, 31, "bad\xFF\xFEname", "Audio/Sink"), Interest::Device);
+    ASSERT_EQ(add(node, 500), Interest::Stream);
     graph.addLink(link, node, 31, now);
     graph.describeNode(node, {.binary = std::string(10'000, 'x')}, "", now);
     const auto heard = listener.news();
@@ -251,7 +305,7 @@ TEST_F(GraphTest, TextIsNeverCutWithinACharacter)
 {
     std::string text(254, 'x');
     text += "\u00e9"; // two bytes, of which one would fit
-    ASSERT_TRUE(add(node, 500));
+    ASSERT_EQ(add(node, 500), Interest::Stream);
     graph.describeNode(node, {.binary = text}, "", now);
 
     EXPECT_EQ(listener.news()[0], "500 appeared output role= application=" + std::string(254, 'x'));

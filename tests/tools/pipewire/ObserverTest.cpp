@@ -2,6 +2,7 @@
 
 #include "kesto-pipewire/Observer.h"
 #include "tools/pipewire/HeadlessPipeWire.h"
+#include "tools/pipewire/RecordingDevices.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -103,7 +104,7 @@ protected:
             timedOut = true;
             loop->quit();
         });
-        observer.emplace(*loop, server.socket(), seen, diagnostics);
+        observer.emplace(*loop, server.socket(), seen, devices, diagnostics);
     }
     void TearDown() override
     {
@@ -143,6 +144,7 @@ protected:
 
     HeadlessPipeWire server;
     Diagnostics diagnostics{false};
+    RecordingDevices devices;
     SeenStreams seen{[this] { quitWhenItHappened(); }};
     std::optional<Loop> loop;
     Source timeout;
@@ -303,6 +305,20 @@ TEST_F(ObserverTest, AStreamThatDoesNotKeepPaceIsLate)
     player->write("pause\n");
 
     EXPECT_TRUE(happens([this] { return !first().runs; }));
+}
+
+TEST_F(ObserverTest, ADeviceIsSeenAtWorkAndInTrouble)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    player->kill(SIGSTOP);
+    ASSERT_TRUE(happens([this] { return first().lateCycles >= 5; }));
+    player->kill(SIGCONT);
+
+    const auto news = devices.news();
+    for (const auto* what : {" output null-sink", " wanted", " running", " cycle", " late cycle"})
+        EXPECT_THAT(news, testing::Contains(testing::EndsWith(what)));
 }
 
 TEST_F(ObserverTest, WhenPipeWireDiesItsStreamsGoAndItsSuccessorsAreSeen)

@@ -267,9 +267,9 @@ TEST(ReadFormatTest, WhatIsNoFormatOfSoundIsNone)
         std::nullopt);
 }
 
-// ---- Late cycles ----
+// ---- Cycles ----
 
-// A profile of cycles, each with its clock and its followers, as the server's profiler makes it.
+// A profile of cycles, each with its clock, its driver and its followers, as the server's profiler makes it.
 class ProfileBuilder : public PodBuilder {
 public:
     ProfileBuilder() { structure(); }
@@ -280,64 +280,98 @@ public:
         key(SPA_PROFILER_clock).structure().integer(0).integer(0).text("clock").wide(began).wide(0).end();
         return *this;
     }
-    ProfileBuilder& follower(std::int32_t node, const char* name, std::int32_t status)
+    ProfileBuilder& driver(std::int32_t node, std::int64_t awake, std::int64_t finish)
     {
-        key(SPA_PROFILER_followerBlock).structure().integer(node).text(name);
-        wide(0).wide(0).wide(0).wide(0).integer(status).end();
-        return *this;
+        return block(SPA_PROFILER_driverBlock, node, awake, finish, 2);
+    }
+    ProfileBuilder& follower(std::int32_t node, std::int32_t status, std::int64_t awake = 0, std::int64_t finish = 0)
+    {
+        return block(SPA_PROFILER_followerBlock, node, awake, finish, status);
     }
     ProfileBuilder& endCycle()
     {
         end();
         return *this;
     }
+
+private:
+    ProfileBuilder& block(std::uint32_t kind, std::int32_t node, std::int64_t awake, std::int64_t finish,
+                          std::int32_t status)
+    {
+        key(kind).structure().integer(node).text("name").wide(0).wide(0).wide(awake).wide(finish).integer(status).end();
+        return *this;
+    }
 };
 
-std::vector<std::string> lateCycles(const spa_pod& profile)
+// Such as "1000: 41 late, 30 50 ns".
+std::vector<std::string> cycles(const spa_pod& profile)
 {
-    std::vector<std::string> late;
-    readLateCycles(profile, [&late](std::uint32_t node, std::int64_t began) {
-        late.push_back(std::to_string(node) + " " + std::to_string(began));
+    std::vector<std::string> told;
+    readCycles(profile, [&told](const Cycle& cycle) {
+        auto text = std::to_string(cycle.began) + ":";
+        for (const auto& [node, work, isLate] : cycle.nodes) {
+            text += (text.ends_with(':') ? " " : ", ") + std::to_string(node);
+            text += work ? " " + std::to_string(*work) + " ns" : "";
+            text += isLate ? " late" : "";
+        }
+        told.push_back(text);
     });
-    return late;
+    return told;
 }
 
-TEST(ReadLateCyclesTest, TellsEveryFollowerThatHasNotFinished)
+TEST(ReadCyclesTest, WhoHasNotFinishedIsLate)
 {
     ProfileBuilder profile;
-    profile.cycle(1000).follower(40, "player", 3).follower(41, "late", 1).endCycle();
-    profile.cycle(2000).follower(40, "player", 2).follower(41, "late", 0).endCycle();
+    profile.cycle(1000).follower(40, 3).follower(41, 1).endCycle();
+    profile.cycle(2000).follower(40, 2).follower(41, 0).endCycle();
 
-    EXPECT_THAT(lateCycles(profile.build()), ElementsAre("41 1000", "40 2000", "41 2000"));
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("1000: 40, 41 late", "2000: 40 late, 41 late"));
 }
 
-TEST(ReadLateCyclesTest, WhatIsNoProfileTellsNothing)
+TEST(ReadCyclesTest, TheDriverIsLateWhenAnyOfItsFollowersIs)
 {
-    EXPECT_THAT(lateCycles(PodBuilder().integer(1).build()), IsEmpty());
-    EXPECT_THAT(lateCycles(PodBuilder().structure().integer(1).text("x").build()), IsEmpty());
-    EXPECT_THAT(lateCycles(PodBuilder().structure().object(SPA_TYPE_OBJECT_Props).build()), IsEmpty());
+    ProfileBuilder profile;
+    profile.cycle(1000).driver(30, 1000, 1050).follower(40, 3).endCycle();
+    profile.cycle(2000).driver(30, 2000, 2060).follower(40, 3).follower(41, 1).endCycle();
+
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("1000: 40, 30 50 ns", "2000: 40, 41 late, 30 60 ns late"));
 }
 
-TEST(ReadLateCyclesTest, BlocksThatAreCutShortTellNothing)
+TEST(ReadCyclesTest, WorkIsFromAwakeToFinishWhereBothAreOfThisCycle)
 {
-    EXPECT_THAT(lateCycles(PodBuilder()
-                               .structure()
-                               .object(SPA_TYPE_OBJECT_Profiler)
-                               .key(SPA_PROFILER_clock)
-                               .structure()
-                               .integer(0)
-                               .integer(0)
-                               .text("clock")
-                               .wide(1000)
-                               .end()
-                               .key(SPA_PROFILER_followerBlock)
-                               .structure()
-                               .integer(41)
-                               .end()
-                               .key(SPA_PROFILER_followerBlock)
-                               .integer(41)
-                               .build()),
-                IsEmpty());
+    ProfileBuilder profile;
+    profile.cycle(1000).follower(40, 3, 1010, 1030).follower(41, 1, 1010, 500).follower(42, 3, 0, 700).endCycle();
+
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("1000: 40 20 ns, 41 late, 42"));
+}
+
+TEST(ReadCyclesTest, WhatIsNoProfileTellsNothing)
+{
+    EXPECT_THAT(cycles(PodBuilder().integer(1).build()), IsEmpty());
+    EXPECT_THAT(cycles(PodBuilder().structure().integer(1).text("x").build()), IsEmpty());
+    EXPECT_THAT(cycles(PodBuilder().structure().object(SPA_TYPE_OBJECT_Props).build()), IsEmpty());
+}
+
+TEST(ReadCyclesTest, BlocksThatAreCutShortTellNothing)
+{
+    PodBuilder profile;
+    profile.structure().object(SPA_TYPE_OBJECT_Profiler);
+    profile.key(SPA_PROFILER_clock).structure().integer(0).integer(0).text("clock").wide(1000).end();
+    profile.key(SPA_PROFILER_driverBlock).structure().integer(30).text("name").end();
+    profile.key(SPA_PROFILER_followerBlock).structure().integer(41).end();
+    profile.key(SPA_PROFILER_followerBlock).integer(41);
+
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("1000:"));
+}
+
+TEST(ReadCyclesTest, ACycleWithoutAClockIsNone)
+{
+    PodBuilder profile;
+    profile.structure().object(SPA_TYPE_OBJECT_Profiler);
+    profile.key(SPA_PROFILER_followerBlock).structure().integer(41).text("name");
+    profile.wide(0).wide(0).wide(0).wide(0).integer(1).end();
+
+    EXPECT_THAT(cycles(profile.build()), IsEmpty());
 }
 
 } // namespace

@@ -1,0 +1,46 @@
+// A listener that remembers what it heard of devices, as lines of text.
+#pragma once
+
+#include "kesto-pipewire/Device.h"
+
+#include <fmt/format.h>
+
+#include <array>
+#include <string>
+#include <string_view>
+#include <utility>
+#include <vector>
+
+namespace kesto_pipewire {
+
+class RecordingDevices : public DeviceListener {
+public:
+    void deviceAppeared(DeviceSerial device, const DeviceDescription& description) override
+    {
+        hear(device, (description.direction == Direction::Output ? "output " : "input ") + description.name);
+    }
+    void deviceStateChanged(DeviceSerial device, DeviceState state, Moment) override
+    {
+        constexpr std::array<std::string_view, 4> names{"suspended", "idle", "running", "error"};
+        hear(device, names[static_cast<std::size_t>(state)]);
+    }
+    void deviceWanted(DeviceSerial device, bool wanted, Moment) override
+    {
+        hear(device, wanted ? "wanted" : "unwanted");
+    }
+    void deviceCycle(DeviceSerial device, const NodeCycle& cycle) override
+    {
+        hear(device, cycle.isLate ? "late cycle" : "cycle");
+    }
+    void deviceGone(DeviceSerial device) override { hear(device, "gone"); }
+
+    // What was heard since the last time that it was asked for, such as "30 running".
+    std::vector<std::string> news() { return std::exchange(heard_, {}); }
+
+private:
+    void hear(DeviceSerial device, std::string_view what) { heard_.push_back(fmt::format("{} {}", device, what)); }
+
+    std::vector<std::string> heard_;
+};
+
+} // namespace kesto_pipewire

@@ -1,0 +1,155 @@
+// The table of the channels, and the arithmetic between what PipeWire tells and what they count.
+#include "kesto-pipewire/DeviceChannels.h"
+
+#include <algorithm>
+#include <cmath>
+#include <utility>
+#include <vector>
+
+namespace kesto_pipewire {
+
+namespace {
+
+constexpr auto driver = "pipewire";
+
+// As `DeviceState` counts them.
+const std::vector<const char*> stateNames{"Suspended", "Idle", "Running", "Error"};
+
+// From a small fraction of the shortest cycle to beyond the longest.
+const std::vector<std::int64_t> workBounds{0, 20, 50, 100, 200, 500, 1000, 2000, 5000, 10000, 20000, 50000, 100000};
+// What nobody notices, up to what everybody does.
+const std::vector<std::int64_t> startBounds{0, 1, 2, 5, 10, 20, 50, 100, 200, 500, 1000, 2000, 5000, 10000};
+
+const char* cycleGroup(Direction direction)
+{
+    return direction == Direction::Output ? "Tx" : "Rx";
+}
+
+// The first of several that failed.
+template <typename... Create> kesto::Status createAll(Create... create)
+{
+    auto status = kesto::Status::Ok;
+    static_cast<void>((((status = create()) == kesto::Status::Ok) && ...));
+    return status;
+}
+
+} // namespace
+
+DeviceChannels::DeviceChannels(std::string root, const Diagnostics& diagnostics) : diagnostics_(diagnostics)
+{
+    kesto::PublisherOptions options;
+    options.root = std::move(root);
+    auto status = publisher_.open(options);
+    if (status == kesto::Status::Ok)
+        status = createTotals();
+    if (status != kesto::Status::Ok)
+        diagnostics_.say("statistics of devices cannot be published: {}", kesto::errorText(status));
+}
+
+kesto::Status DeviceChannels::createTotals()
+{
+    return createAll([&] { return totals_[0].create(publisher_, Direction::Output, ""); },
+                     [&] { return totals_[1].create(publisher_, Direction::Input, ""); },
+                     [&] { return anyRuns_.create(publisher_, {driver, "Speaker", "", "any"}, {"Idle", "Running"}); },
+                     [&] {
+                         return startTimes_.create(publisher_, {driver, "StateTransitionTimes_ms", "", "to Running"},
+                                                   "ms", startBounds);
+                     });
+}
+
+kesto::Status DeviceChannels::CycleChannels::create(const kesto::Publisher& publisher, Direction direction,
+                                                    const std::string& subgroup)
+{
+    const auto* group = cycleGroup(direction);
+    return createAll([&] { return cycles.create(publisher, {driver, group, subgroup, "cycles"}); },
+                     [&] { return lateCycles.create(publisher, {driver, group, subgroup, "late cycles"}); },
+                     [&] { return workTimes.create(publisher, {driver, group, subgroup, "work"}, "us", workBounds); });
+}
+
+kesto::Status DeviceChannels::create(Device& device, const DeviceDescription& description)
+{
+    const auto& name = description.name;
+    return createAll([&] { return device.cycles.create(publisher_, description.direction, name); },
+                     [&] { return device.states.create(publisher_, {driver, "Speaker", name, "state"}, stateNames); },
+                     [&] {
+                         return device.startTimes.create(
+                             publisher_, {driver, "StateTransitionTimes_ms", name, "to Running"}, "ms", startBounds);
+                     });
+}
+
+void DeviceChannels::CycleChannels::count(const NodeCycle& cycle)
+{
+    constexpr std::int64_t nanosecondsAMicrosecond = 1000;
+    cycles.add(1);
+    if (cycle.isLate)
+        lateCycles.add(1);
+    if (cycle.workNanoseconds)
+        workTimes.record(*cycle.workNanoseconds / nanosecondsAMicrosecond);
+}
+
+DeviceChannels::Device* DeviceChannels::find(DeviceSerial serial)
+{
+    const auto found = devices_.find(serial);
+    return found == devices_.end() ? nullptr : &found->second;
+}
+
+void DeviceChannels::deviceAppeared(DeviceSerial serial, const DeviceDescription& description)
+{
+    Device device;
+    device.direction = description.direction;
+    if (const auto status = create(device, description); status != kesto::Status::Ok)
+        diagnostics_.detail("no statistics of {}: {}", description.name, kesto::errorText(status));
+    devices_.insert_or_assign(serial, std::move(device));
+}
+
+void DeviceChannels::deviceStateChanged(DeviceSerial serial, DeviceState state, Moment when)
+{
+    auto* device = find(serial);
+    if (device == nullptr || device->state == state)
+        return;
+    device->state = state;
+    device->states.enter(static_cast<std::size_t>(state));
+    if (state == DeviceState::Running && device->wantedSince) {
+        constexpr double millisecondsASecond = 1000;
+        const auto wanted = std::exchange(device->wantedSince, std::nullopt);
+        const auto milliseconds = std::llround((when.uptime - wanted->uptime) * millisecondsASecond);
+        device->startTimes.record(milliseconds);
+        startTimes_.record(milliseconds);
+    }
+    countRunning();
+}
+
+void DeviceChannels::deviceWanted(DeviceSerial serial, bool wanted, Moment when)
+{
+    auto* device = find(serial);
+    if (device == nullptr)
+        return;
+    if (!wanted)
+        device->wantedSince.reset();
+    else if (!device->wantedSince && device->state != DeviceState::Running)
+        device->wantedSince = when;
+}
+
+void DeviceChannels::deviceCycle(DeviceSerial serial, const NodeCycle& cycle)
+{
+    auto* device = find(serial);
+    if (device == nullptr)
+        return;
+    device->cycles.count(cycle);
+    totals_[static_cast<std::size_t>(device->direction)].count(cycle);
+}
+
+void DeviceChannels::deviceGone(DeviceSerial serial)
+{
+    devices_.erase(serial);
+    countRunning();
+}
+
+void DeviceChannels::countRunning()
+{
+    const bool anyRuns =
+        std::ranges::any_of(devices_, [](const auto& each) { return each.second.state == DeviceState::Running; });
+    anyRuns_.enter(anyRuns ? 1 : 0);
+}
+
+} // namespace kesto_pipewire
