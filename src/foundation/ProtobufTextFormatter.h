@@ -1,0 +1,31 @@
+// Messages of protocol buffers as text for people, in the text format that the protocol's own tools write and read:
+// a field a line, objects in braces and indented.
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace foundation {
+
+// Names are those of fields. One thread at a time.
+class ProtobufTextFormatter {
+public:
+    // Appends to `out`, which outlives the formatter.
+    explicit ProtobufTextFormatter(std::string& out) noexcept : out_(out) { }
+
+    void beginObject(std::string_view name);
+    void endObject(); // the one begun last
+
+    void format(std::string_view name, std::uint64_t value);
+    // In quotation marks; whatever is not a printable character of ASCII becomes an escape.
+    void format(std::string_view name, std::string_view text);
+
+private:
+    void indent() { out_.append(2 * depth_, ' '); }
+
+    std::string& out_;
+    std::size_t depth_ = 0;
+};
+
+} // namespace foundation
