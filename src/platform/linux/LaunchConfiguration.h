@@ -24,6 +24,7 @@ struct LaunchConfiguration {
     std::filesystem::path logsDirectory = {}; // the root of the diagnostic files
     std::filesystem::path configurationDirectory = {}; // need not be there; what it lacks has its default
     std::filesystem::path channelRoot = {}; // empty when neither it nor a runtime directory was given
+    std::filesystem::path soundRoot = "/proc/asound"; // what the kernel tells about sound cards; never set from outside
     LogThresholds logThresholds = {};
 
     // Reads the environment and looks at the directories. The error is one line for a person: what is missing or

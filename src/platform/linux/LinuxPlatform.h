@@ -20,6 +20,7 @@
 #include "platform/linux/LinuxNotifications.h"
 #include "platform/linux/LinuxPreferences.h"
 #include "platform/linux/LinuxProcessTable.h"
+#include "platform/linux/LinuxReportingChannels.h"
 #include "platform/linux/LinuxWorkQueues.h"
 
 namespace platform {
@@ -44,7 +45,7 @@ private:
     LinuxFileSystem fileSystem_;
     LinuxNotifications notifications_;
     AbsentTraceMarkers traceMarkers_;
-    AbsentReportingChannels reportingChannels_;
+    LinuxReportingChannels reportingChannels_;
     AbsentBugCapture bugCapture_;
     AbsentKernelTrace kernelTrace_;
     AbsentPerformanceWriter performanceWriter_;

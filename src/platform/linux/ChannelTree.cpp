@@ -1,0 +1,199 @@
+// One walk for one question, with one budget of names, channels and bytes for all of it, and in the order of the
+// names.
+#include "platform/linux/ChannelTree.h"
+
+#include "foundation/String.h"
+#include "platform/linux/ChannelFile.h"
+#include "platform/linux/FileDescriptor.h"
+#include "platform/linux/SystemErrorText.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <dirent.h>
+#include <fcntl.h>
+#include <memory>
+#include <sys/stat.h>
+
+namespace platform {
+namespace {
+
+constexpr std::string_view missingName = "-";
+
+// An open folder.
+struct CloseFolder {
+    void operator()(DIR* folder) const noexcept { ::closedir(folder); }
+};
+using Folder = std::unique_ptr<DIR, CloseFolder>;
+
+// Null, with `errno`, when it cannot be opened. Below the root no link is followed.
+Folder openFolder(int parent, const char* name, int linkFlag)
+{
+    const int descriptor = ::openat(parent, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC | linkFlag);
+    if (descriptor < 0)
+        return nullptr;
+    Folder folder(::fdopendir(descriptor));
+    if (!folder)
+        ::close(descriptor);
+    return folder;
+}
+
+struct Entry {
+    std::string name;
+    unsigned char type; // as of readdir
+};
+
+std::optional<std::string> nameOrNothing(const std::string& folder)
+{
+    return folder == missingName ? std::nullopt : std::optional(folder);
+}
+
+// One walk through the tree.
+class Reader {
+public:
+    Reader(const ChannelSelection& selection, const ChannelTree::Limits& limits) : selection_(selection), left_(limits)
+    {
+    }
+
+    void readFolder(DIR* folder, std::size_t level)
+    {
+        for (const Entry& entry : entriesOf(folder)) {
+            names_[level] = entry.name;
+            if (level == channelLevel)
+                readChannel(::dirfd(folder), entry.type);
+            else if (isSelected(level) && (entry.type == DT_DIR || entry.type == DT_LNK || entry.type == DT_UNKNOWN))
+                descend(::dirfd(folder), level);
+        }
+    }
+
+    [[nodiscard]] ChannelReading take() && { return std::move(reading_); }
+
+private:
+    enum Level : std::size_t { driverLevel, groupLevel, subgroupLevel, channelLevel, levels };
+
+    // Sorted, so that what is read does not depend on the order in which it was written.
+    std::vector<Entry> entriesOf(DIR* folder)
+    {
+        std::vector<Entry> entries;
+        while (const dirent* entry = ::readdir(folder)) {
+            if (left_.names == 0) {
+                ++reading_.leftOut; // at least
+                break;
+            }
+            --left_.names;
+            if (entry->d_name[0] != '.')
+                entries.push_back({entry->d_name, entry->d_type});
+        }
+        std::ranges::sort(entries, {}, &Entry::name);
+        return entries;
+    }
+
+    [[nodiscard]] bool isSelected(std::size_t level) const
+    {
+        const auto isMeant = [&](const std::optional<std::string>& name) {
+            return !name || nameOrNothing(names_[level]) == name;
+        };
+        return level == groupLevel   ? isMeant(selection_.group)
+            : level == subgroupLevel ? isMeant(selection_.subgroup)
+                                     : true;
+    }
+
+    void descend(int parent, std::size_t level)
+    {
+        if (const Folder folder = openFolder(parent, names_[level].c_str(), O_NOFOLLOW))
+            readFolder(folder.get(), level + 1);
+        else if (errno != ENOENT)
+            fail(systemErrorText(errno), level);
+    }
+
+    void readChannel(int folder, unsigned char type)
+    {
+        if (left_.channels == 0 || left_.bytes == 0) {
+            ++reading_.leftOut;
+            return;
+        }
+        if (type != DT_REG && type != DT_UNKNOWN) // to open a device may already do something
+            return fail("it is not a regular file");
+        const auto text = readFile(folder);
+        if (!text)
+            return;
+        left_.bytes -= std::min(left_.bytes, text->size());
+        auto channel = parseChannelFile(*text);
+        if (!channel)
+            return fail(description(channel.error()));
+        if (!std::ranges::all_of(names_, foundation::isValidUtf8))
+            return fail("its name is not UTF-8");
+        channel->driver = names_[driverLevel];
+        channel->group = nameOrNothing(names_[groupLevel]);
+        channel->subgroup = nameOrNothing(names_[subgroupLevel]);
+        channel->name = names_[channelLevel];
+        reading_.channels.push_back(*std::move(channel));
+        --left_.channels;
+    }
+
+    // Valid until the next one; nothing when it cannot be read, which is noted unless it is gone.
+    std::optional<std::string_view> readFile(int folder)
+    {
+        const FileDescriptor file(
+            ::openat(folder, names_[channelLevel].c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+        struct stat status = {};
+        if (!file || ::fstat(file.get(), &status) != 0) {
+            if (errno != ENOENT)
+                fail(systemErrorText(errno));
+            return std::nullopt;
+        }
+        if (!S_ISREG(status.st_mode))
+            fail("it is not a regular file");
+        else if (static_cast<std::uint64_t>(status.st_size) > largestChannelFile)
+            fail("it is too large");
+        else
+            return readBytes(file.get(), static_cast<std::size_t>(status.st_size));
+        return std::nullopt;
+    }
+
+    // As many as there were when it was opened: a file in place is replaced and never changed.
+    std::optional<std::string_view> readBytes(int file, std::size_t size)
+    {
+        for (std::size_t length = 0; length < size;) {
+            const ssize_t count = ::read(file, buffer_.data() + length, size - length);
+            if (count < 0 && errno != EINTR) {
+                fail(systemErrorText(errno));
+                return std::nullopt;
+            }
+            if (count == 0)
+                return std::string_view(buffer_.data(), length);
+            length += static_cast<std::size_t>(std::max<ssize_t>(count, 0));
+        }
+        return std::string_view(buffer_.data(), size);
+    }
+
+    void fail(std::string_view reason, std::size_t level = channelLevel)
+    {
+        std::string path = names_[0];
+        for (std::size_t below = 1; below <= level; ++below)
+            path.append("/").append(names_[below]);
+        reading_.problems.push_back({std::move(path), reason});
+    }
+
+    const ChannelSelection& selection_;
+    std::array<std::string, levels> names_; // of the folders on the way, and of the channel
+    ChannelReading reading_;
+    ChannelTree::Limits left_;
+    std::array<char, largestChannelFile> buffer_;
+};
+
+} // namespace
+
+std::expected<ChannelReading, std::error_code> ChannelTree::read(const ChannelSelection& selection) const
+{
+    const Folder folder = openFolder(AT_FDCWD, root_.c_str(), 0);
+    if (!folder && errno == ENOENT)
+        return ChannelReading();
+    if (!folder)
+        return std::unexpected(std::error_code(errno, std::generic_category()));
+    Reader reader(selection, limits_);
+    reader.readFolder(folder.get(), 0);
+    return std::move(reader).take();
+}
+
+} // namespace platform

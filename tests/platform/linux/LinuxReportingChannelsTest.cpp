@@ -1,0 +1,192 @@
+// The reporting channels of this system: what is published and what the kernel tells, found, sampled and compared as
+// the service does it.
+#include "platform/linux/LinuxReportingChannels.h"
+#include "platform/linux/TemporaryDirectory.h"
+#include "support/FakeLog.h"
+
+#include <gmock/gmock.h>
+#include <map>
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using enum LogLevel;
+using support::IsLine;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::Pair;
+using testing::SizeIs;
+
+class LinuxReportingChannelsTest : public testing::Test {
+protected:
+    using Name = std::optional<std::string_view>;
+
+    void publish(const fs::path& place, std::string_view text)
+    {
+        fs::create_directories((root / place).parent_path());
+        support::writeFile(root / place, text);
+    }
+    ReportingChannels::Subscribed subscribe(Name group, Name subgroup)
+    {
+        return channels.createSubscription(*channels.copyChannelsInGroup(group, subgroup).channels);
+    }
+    ReportingSample sample(const ReportingChannels::Subscribed& subscribed)
+    {
+        return channels.createSamples(*subscribed.subscription, *subscribed.channels).value();
+    }
+    static std::map<std::string, std::int64_t> valuesOf(const ReportingSample& sample)
+    {
+        std::map<std::string, std::int64_t> values;
+        for (const ReportingChannel& channel : sample.channels)
+            values[*channel.name] = channel.value;
+        return values;
+    }
+
+    const support::TemporaryDirectory directory;
+    const fs::path root = directory.path() / "channels";
+    const fs::path sound = directory.path() / "asound";
+    support::FakeLog log;
+    LinuxReportingChannels channels{root, sound, ProviderLog(log)};
+};
+
+TEST_F(LinuxReportingChannelsTest, AreNoneOnADeviceWhereNobodyPublishes)
+{
+    const auto found = channels.copyChannelsInGroup("Speaker", std::nullopt);
+    EXPECT_EQ(found.error, std::nullopt);
+    ASSERT_NE(found.channels, nullptr);
+    EXPECT_EQ(channels.channelCount(*found.channels), 0U);
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(LinuxReportingChannelsTest, AreFoundByGroupAndBySubgroup)
+{
+    publish("amp/Speaker/MCA/a", "simple\n1\n");
+    publish("amp/Speaker/-/b", "simple\n2\n");
+    publish("amp/-/MCA/c", "simple\n3\n");
+    const auto count = [&](Name group, Name subgroup) {
+        return channels.channelCount(*channels.copyChannelsInGroup(group, subgroup).channels);
+    };
+    EXPECT_EQ(count("Speaker", std::nullopt), 2U);
+    EXPECT_EQ(count(std::nullopt, "MCA"), 2U);
+    EXPECT_EQ(count("Speaker", "MCA"), 1U);
+    EXPECT_EQ(count("Rx", std::nullopt), 0U);
+}
+
+TEST_F(LinuxReportingChannelsTest, TellHowTheyChangedBetweenTwoSamples)
+{
+    publish("amp/Speaker/-/kept", "simple\n10\n");
+    publish("amp/Speaker/-/gone", "simple\n10\n");
+    publish("amp/Speaker/-/begun anew", "simple\n10\n");
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    const auto before = sample(subscribed);
+    publish("amp/Speaker/-/kept", "simple\n15\n");
+    fs::remove(root / "amp/Speaker/-/gone");
+    publish("amp/Speaker/-/begun anew", "simple\n4\n");
+    publish("amp/Speaker/-/new", "simple\n7\n");
+    const auto difference = channels.createDifference(before, sample(subscribed));
+    EXPECT_THAT(valuesOf(*difference), ElementsAre(Pair("begun anew", 4), Pair("kept", 5), Pair("new", 7)));
+}
+
+TEST_F(LinuxReportingChannelsTest, HoldThoseOfTheSoundCardsInTheirGroups)
+{
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "hda-laptop", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    publish("mixer/Tx/-/late cycles", "simple\n3\n");
+    const auto subscribed = subscribe("Tx", std::nullopt);
+    EXPECT_EQ(channels.channelCount(*subscribed.channels), 13U);
+    const auto before = sample(subscribed);
+    const fs::path status = sound / "card0/pcm0p/sub0/status";
+    std::string text = support::readFile(status);
+    const std::string pointer = "hw_ptr      : 737280";
+    text.replace(text.find(pointer), pointer.size(), "hw_ptr      : 785280");
+    const std::string now = "tstamp      : 10817.482731009";
+    text.replace(text.find(now), now.size(), "tstamp      : 10818.482731009");
+    support::writeFile(status, text);
+    const auto difference = channels.createDifference(before, sample(subscribed)).value();
+    EXPECT_EQ(valuesOf(difference).at("late cycles"), 0);
+    const auto isAnalog = [](const ReportingChannel& channel) { return channel.subgroup == "pcm0p"; };
+    std::vector<ReportingChannel> analog;
+    std::ranges::copy_if(difference.channels, std::back_inserter(analog), isAnalog);
+    ASSERT_THAT(analog, SizeIs(4));
+    EXPECT_EQ(analog[0].value, 48'000);
+    EXPECT_EQ(analog[2].states[0].residency, 1000U);
+    EXPECT_EQ(analog[2].states[0].transitions, 0U) << "it was running before";
+    EXPECT_EQ(analog[3].states[0].name, "S32_LE/48000/2");
+}
+
+TEST_F(LinuxReportingChannelsTest, SayOnceWhatIsWrongWithAFile)
+{
+    publish("amp/Speaker/-/right", "simple\n1\n");
+    publish("amp/Speaker/-/wrong", "simple\n1");
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl", "channel amp/Speaker/-/wrong is left out: it is not finished")));
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(1));
+    EXPECT_THAT(log.take(), IsEmpty());
+    publish("amp/Speaker/-/wrong", "complicated\n1\n");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(1));
+    EXPECT_THAT(log.take(), SizeIs(1)) << "something else is wrong now";
+    publish("amp/Speaker/-/wrong", "simple\n2\n");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(2));
+    EXPECT_THAT(log.take(), IsEmpty());
+    publish("amp/Speaker/-/wrong", "complicated\n1\n");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(1));
+    EXPECT_THAT(log.take(), SizeIs(1)) << "again";
+}
+
+TEST_F(LinuxReportingChannelsTest, NameOnlySoManyFilesAtOnce)
+{
+    for (std::size_t index = 0; index < LinuxReportingChannels::mostNamedProblems + 5; ++index)
+        publish("amp/Speaker/-/" + std::to_string(index), "half");
+    subscribe("Speaker", std::nullopt);
+    const auto lines = log.take();
+    ASSERT_THAT(lines, SizeIs(LinuxReportingChannels::mostNamedProblems + 1));
+    EXPECT_EQ(lines.back().message, "5 more channels are left out");
+}
+
+TEST_F(LinuxReportingChannelsTest, SayOnceThatThereIsMoreThanASampleTakes)
+{
+    std::string large = "histogram\n0 0\n";
+    while (large.size() < 30'000)
+        large += "1000000000000000000 1000000000000000001 1000000000000000000\n";
+    const std::size_t fitting = (ChannelTree::Limits().bytes + large.size() - 1) / large.size();
+    for (std::size_t index = 0; index < fitting + 2; ++index)
+        publish("amp/Speaker/-/" + std::to_string(index), large);
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl",
+                                   "2 files are left out: one sample takes 4096 channels and 2097152 "
+                                   "bytes of them")));
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(fitting));
+    EXPECT_THAT(log.take(), IsEmpty()) << "once";
+}
+
+TEST_F(LinuxReportingChannelsTest, ComeBackBesideTheErrorWhenTheTreeCannotBeRead)
+{
+    support::writeFile(root, "a file in its place");
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    const auto found = channels.copyChannelsInGroup("Tx", std::nullopt);
+    EXPECT_EQ(found.error, ENOTDIR);
+    ASSERT_NE(found.channels, nullptr);
+    EXPECT_EQ(channels.channelCount(*found.channels), 16U);
+    const auto subscribed = channels.createSubscription(*found.channels);
+    EXPECT_EQ(channels.createSamples(*subscribed.subscription, *subscribed.channels).error(), ENOTDIR);
+    fs::remove(root);
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(16));
+}
+
+TEST_F(LinuxReportingChannelsTest, OfASubscriptionStayItsOwnWhenTheTreeGoesAndComesBack)
+{
+    publish("amp/Speaker/-/a", "simple\n1\n");
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    fs::remove_all(root);
+    EXPECT_THAT(sample(subscribed).channels, IsEmpty());
+    publish("amp/Speaker/-/a", "simple\n2\n");
+    publish("amp/Tx/-/b", "simple\n3\n");
+    EXPECT_THAT(valuesOf(sample(subscribed)), ElementsAre(Pair("a", 2)));
+}
+
+} // namespace
+} // namespace platform
