@@ -6,6 +6,7 @@
 #include "RawClient.h"
 #include "foundation/Value.h"
 
+#include <cstdint>
 #include <string>
 #include <string_view>
 
@@ -13,8 +14,10 @@ namespace bench {
 
 class ServiceProcess {
 public:
+    enum class Build : std::uint8_t { Customer, Internal };
+
     // `used` is the TOML array of the event names in use. Returns before the service listens.
-    explicit ServiceProcess(const Options& options, std::string_view used = "[]");
+    explicit ServiceProcess(const Options& options, std::string_view used = "[]", Build build = Build::Customer);
 
     [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
     [[nodiscard]] std::filesystem::path socketPath() const;
