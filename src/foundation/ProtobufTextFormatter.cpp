@@ -1,3 +1,4 @@
+// Text is escaped so that the protocol's own parser reads back the bytes that there were.
 #include "foundation/ProtobufTextFormatter.h"
 
 #include "foundation/Format.h"

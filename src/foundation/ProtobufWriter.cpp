@@ -1,3 +1,4 @@
+// A field is its tag, its value, and nothing between: each is put in place by one step on the string.
 #include "foundation/ProtobufWriter.h"
 
 #include "foundation/ProtobufReader.h"

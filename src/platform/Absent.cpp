@@ -37,18 +37,6 @@ namespace {
 
 class AbsentBugCaptureReporter final : public BugCaptureReporter {
 public:
-    foundation::Dictionary makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
-                                         std::string_view subtypeContext, std::string_view detectedProcess,
-                                         const std::optional<foundation::Value>& triggerThresholdValues) override
-    {
-        foundation::Dictionary signature{{"domain", domain},
-                                         {"type", type},
-                                         {"subType", subType},
-                                         {"subtypeContext", subtypeContext},
-                                         {"detectedProcess", detectedProcess}};
-        return triggerThresholdValues ? signature.with("triggerThresholdValues", *triggerThresholdValues) : signature;
-    }
-
     void requestSnapshot(foundation::Dictionary, double, const std::optional<foundation::Value>&,
                          const std::optional<foundation::Value>&, Reply reply) override
     {

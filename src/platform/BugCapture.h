@@ -16,10 +16,11 @@ public:
     using Reply = std::move_only_function<void(foundation::Dictionary response)>;
 
     virtual ~BugCaptureReporter() = default;
+    // A dictionary of the arguments by their names, without those that there are not.
     [[nodiscard]] virtual foundation::Dictionary
     makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
                   std::string_view subtypeContext, std::string_view detectedProcess,
-                  const std::optional<foundation::Value>& triggerThresholdValues) = 0;
+                  const std::optional<foundation::Value>& triggerThresholdValues);
     // The reply comes later, on a queue of the service's choosing.
     virtual void requestSnapshot(foundation::Dictionary signature, double duration,
                                  const std::optional<foundation::Value>& event,
@@ -31,6 +32,11 @@ class BugCapture {
 public:
     virtual ~BugCapture() = default;
     [[nodiscard]] virtual std::unique_ptr<BugCaptureReporter> makeReporter() = 0;
+
+    // How whoever asks for snapshots is at that moment, to be kept in them: it is asked with each request, where and
+    // when that is made. To be set before the first; none unless it is.
+    using StateDescription = std::function<foundation::Value()>;
+    virtual void setStateDescription(StateDescription /*describe*/) { }
 };
 
 } // namespace platform

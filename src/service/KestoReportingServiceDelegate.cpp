@@ -18,8 +18,13 @@ std::shared_ptr<KestoReportingServiceDelegate> KestoReportingServiceDelegate::ma
     std::shared_ptr<KestoReportingServiceDelegate> service(new KestoReportingServiceDelegate);
     service->listenForFeatureStateChanges();
     service->driverUtility_ = std::make_unique<KestoReportingDriverUtility>();
-    if (KestoReportingUtilityIsInternalBuild())
+    if (KestoReportingUtilityIsInternalBuild()) {
         service->vorpStateManager_ = std::make_unique<KestoReportingUtilityVorpStateManager>();
+        platform::current().bugCapture.setStateDescription([weak = std::weak_ptr(service)] {
+            const auto self = weak.lock();
+            return self ? self->stateForBugCapture() : foundation::Value();
+        });
+    }
     return service;
 }
 

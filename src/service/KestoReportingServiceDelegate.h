@@ -74,6 +74,7 @@ private:
     void handleFeatureChange(std::int32_t token);
     [[nodiscard]] static std::optional<foundation::Value> valueOf(const Feature& feature);
     [[nodiscard]] std::string descriptionOfFeatures() const;
+    [[nodiscard]] foundation::Value stateForBugCapture() const;
     void registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client);
     static void handleInvalidation(std::int32_t processIdentifier,
                                    const std::shared_ptr<KestoReportingClientServerInstance>& client);

@@ -1,3 +1,4 @@
+// One step a message: it is no report, repeats the last one, is counted, or makes the second that asks for a snapshot.
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 
 #include "platform/Platform.h"

@@ -21,12 +21,15 @@ public:
     // The snapshots asked for, in order; `snapshots()[0].reply(...)` answers one.
     [[nodiscard]] std::vector<Snapshot>& snapshots() { return snapshots_; }
     [[nodiscard]] int reportersMade() const { return reportersMade_; }
+    // What a snapshot would keep of the service now; null when it does not tell.
+    [[nodiscard]] foundation::Value describeState() const { return describe_ ? describe_() : foundation::Value(); }
 
     std::unique_ptr<platform::BugCaptureReporter> makeReporter() override
     {
         ++reportersMade_;
         return std::make_unique<Reporter>(snapshots_);
     }
+    void setStateDescription(StateDescription describe) override { describe_ = std::move(describe); }
 
 private:
     class Reporter final : public platform::BugCaptureReporter {
@@ -57,6 +60,7 @@ private:
 
     std::vector<Snapshot> snapshots_;
     int reportersMade_ = 0;
+    StateDescription describe_;
 };
 
 } // namespace support

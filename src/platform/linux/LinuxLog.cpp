@@ -1,6 +1,10 @@
+// A line is made once, escaped and cut, whichever way it leaves, so that the journal, standard error and a bug
+// capture all say the same.
 #include "platform/linux/LinuxLog.h"
 
+#include "platform/linux/LinuxClock.h"
 #include "platform/linux/ProviderLog.h"
+#include "platform/linux/Utf8.h"
 
 #include <cerrno>
 #include <cstdlib>
@@ -62,13 +66,7 @@ void appendEscaped(std::string_view text, Buffer& out)
 void appendLine(const LogRecord& record, Buffer& out)
 {
     out.append(logPrefix(record.location));
-    std::string_view message = record.message;
-    if (message.size() > LinuxLog::longestMessage) {
-        std::size_t end = LinuxLog::longestMessage;
-        while (end > 0 && (static_cast<unsigned char>(message[end]) & 0xC0) == 0x80)
-            --end; // not inside a character
-        message = message.substr(0, end);
-    }
+    const std::string_view message = cutBetweenCharacters(record.message, LinuxLog::longestMessage);
     appendEscaped(message, out);
     if (message.size() < record.message.size())
         fmt::format_to(std::back_inserter(out), "... ({} bytes more)", record.message.size() - message.size());
@@ -111,6 +109,7 @@ void LinuxLog::write(const LogRecord& record)
     Buffer line;
     appendLine(record, line);
     const std::string_view text(line.data(), line.size());
+    recentLines_.add(LinuxClock().secondsSince1970(), record.level, record.category.tag(), text);
     switch (journal_ ? sendToJournal(record, text) : Sent::NoJournal) {
     case Sent::Yes: reportLost(); break;
     case Sent::Lost: ++lostLines_; break;

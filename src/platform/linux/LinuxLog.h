@@ -9,6 +9,7 @@
 #include "platform/Log.h"
 #include "platform/linux/FileDescriptor.h"
 #include "platform/linux/LogThresholds.h"
+#include "platform/linux/RecentLogLines.h"
 
 #include <atomic>
 #include <string>
@@ -42,6 +43,9 @@ public:
     // that is not there is replaced by the descriptor.
     void write(const LogRecord& record) override;
 
+    // What was written last, wherever it went.
+    [[nodiscard]] const RecentLogLines& recentLines() const noexcept { return recentLines_; }
+
 private:
     enum class Sent : std::uint8_t { Yes, Lost, NoJournal };
 
@@ -56,6 +60,7 @@ private:
     sockaddr_un journalAddress_{};
     std::atomic<bool> journalIsBehind_ = false;
     std::atomic<std::uint64_t> lostLines_ = 0;
+    RecentLogLines recentLines_;
 };
 
 } // namespace platform

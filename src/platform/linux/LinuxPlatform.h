@@ -12,6 +12,7 @@
 #include "platform/linux/AnalyticsStore.h"
 #include "platform/linux/ConfigurationWatcher.h"
 #include "platform/linux/LaunchConfiguration.h"
+#include "platform/linux/LinuxBugCapture.h"
 #include "platform/linux/LinuxClock.h"
 #include "platform/linux/LinuxDeviceProperties.h"
 #include "platform/linux/LinuxFeatureFlags.h"
@@ -46,7 +47,7 @@ private:
     LinuxNotifications notifications_;
     AbsentTraceMarkers traceMarkers_;
     LinuxReportingChannels reportingChannels_;
-    AbsentBugCapture bugCapture_;
+    LinuxBugCapture bugCapture_;
     AbsentKernelTrace kernelTrace_;
     AbsentPerformanceWriter performanceWriter_;
     AnalyticsStore analytics_;

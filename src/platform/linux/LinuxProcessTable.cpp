@@ -1,7 +1,7 @@
 #include "platform/linux/LinuxProcessTable.h"
 
-#include "foundation/String.h"
 #include "platform/linux/SmallFile.h"
+#include "platform/linux/Utf8.h"
 
 #include <cerrno>
 #include <ctime>
@@ -14,27 +14,6 @@ namespace {
 
 constexpr std::size_t longestName = 64; // of kernel threads; processes have at most 15 bytes
 
-std::size_t lengthOfFirstCharacter(std::string_view text)
-{
-    for (std::size_t length = 1; length <= std::min<std::size_t>(4, text.size()); ++length)
-        if (foundation::isValidUtf8(text.substr(0, length)))
-            return length;
-    return 0;
-}
-
-// A process names itself, in any bytes; the kernel cuts the name, be it inside a character.
-void replaceWhatIsNotUtf8(std::string& name)
-{
-    if (foundation::isValidUtf8(name))
-        return;
-    for (std::size_t at = 0; at < name.size();) {
-        const std::size_t length = lengthOfFirstCharacter(std::string_view(name).substr(at));
-        if (length == 0)
-            name[at] = '?';
-        at += std::max<std::size_t>(1, length);
-    }
-}
-
 std::optional<std::string> readName(std::string_view process)
 {
     auto name = readSmallFile(fmt::format("/proc/{}/comm", process), longestName);
@@ -42,6 +21,7 @@ std::optional<std::string> readName(std::string_view process)
         return std::nullopt;
     if (name->ends_with('\n'))
         name->pop_back();
+    // A process names itself, in any bytes; the kernel cuts the name, be it inside a character.
     replaceWhatIsNotUtf8(*name);
     return std::move(*name);
 }

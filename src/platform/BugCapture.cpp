@@ -1,0 +1,19 @@
+// A signature is the same wherever snapshots are kept.
+#include "platform/BugCapture.h"
+
+namespace platform {
+
+foundation::Dictionary BugCaptureReporter::makeSignature(std::string_view domain, std::string_view type,
+                                                         std::string_view subType, std::string_view subtypeContext,
+                                                         std::string_view detectedProcess,
+                                                         const std::optional<foundation::Value>& triggerThresholdValues)
+{
+    foundation::Dictionary signature{{"domain", domain},
+                                     {"type", type},
+                                     {"subType", subType},
+                                     {"subtypeContext", subtypeContext},
+                                     {"detectedProcess", detectedProcess}};
+    return triggerThresholdValues ? signature.with("triggerThresholdValues", *triggerThresholdValues) : signature;
+}
+
+} // namespace platform

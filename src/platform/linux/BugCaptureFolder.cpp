@@ -1,0 +1,236 @@
+// Everything is done from the open folder by names in it, and what comes or goes does so under a hidden name:
+// whenever the service is killed, a capture is whole or it is not there.
+#include "platform/linux/BugCaptureFolder.h"
+
+#include "platform/linux/FilesAt.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <charconv>
+#include <cmath>
+#include <ctime>
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <limits>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <unistd.h>
+#include <utility>
+
+namespace platform {
+namespace {
+
+constexpr const char* folderName = "bug-captures";
+constexpr const char* stateName = "state";
+constexpr mode_t permissions = 0750; // of folders: what a capture holds is for the service's group
+
+constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
+
+std::error_code lastError()
+{
+    return {errno, std::generic_category()};
+}
+
+// Hidden names are those of folders that are coming or going.
+constexpr std::string_view coming = ".new";
+constexpr std::string_view going = ".old";
+
+// The number that a capture's name begins with; 0 for names of other things.
+std::uint64_t numberOf(std::string_view name)
+{
+    std::uint64_t number = 0;
+    const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), number);
+    return error == std::errc() && end != name.data() + name.size() && *end == '-' ? number : 0;
+}
+
+std::string utcText(double time)
+{
+    constexpr std::size_t longest = 64;
+    std::array<char, longest> text{};
+    const auto seconds = static_cast<std::time_t>(std::floor(time));
+    std::tm parts{};
+    if (::gmtime_r(&seconds, &parts) == nullptr)
+        return "unknown";
+    return {text.data(), std::strftime(text.data(), text.size(), "%Y%m%dT%H%M%SZ", &parts)};
+}
+
+// Takes something out of sight at once, and then away.
+void remove(int directory, const std::string& name, int folder)
+{
+    const std::string hidden(going);
+    static_cast<void>(removeTreeAt(folder, hidden)); // of an attempt that failed
+    if (::renameat(directory, name.c_str(), folder, hidden.c_str()) == 0)
+        static_cast<void>(removeTreeAt(folder, hidden)); // what stays is removed at the next start
+}
+
+std::error_code syncDirectory(int directory)
+{
+    return ::fsync(directory) == 0 ? std::error_code() : lastError();
+}
+
+std::error_code writeAll(int directory, const std::vector<BugCaptureFolder::File>& files)
+{
+    for (const auto& [name, text] : files)
+        if (const auto error = writeFileAt(directory, name, text))
+            return error;
+    return syncDirectory(directory);
+}
+
+std::expected<FileDescriptor, std::error_code> makeDirectoryAt(int directory, const std::string& name)
+{
+    if (::mkdirat(directory, name.c_str(), permissions) != 0)
+        return std::unexpected(lastError());
+    return openDirectoryAt(directory, name);
+}
+
+} // namespace
+
+// As the disk shows it.
+struct BugCaptureFolder::Capture {
+    std::uint64_t number;
+    std::string name;
+    std::optional<std::uint64_t> bulk; // in bytes; nothing for a tombstone
+};
+
+BugCaptureFolder::BugCaptureFolder(std::filesystem::path stateDirectory, Limits limits)
+    : stateDirectory_(std::move(stateDirectory)),
+      path_(stateDirectory_ / folderName),
+      limits_(limits)
+{
+    if (const auto folder = open())
+        removeLeftovers(folder->get());
+}
+
+std::expected<FileDescriptor, std::error_code> BugCaptureFolder::open() const
+{
+    // The state directory may be a link: it is the administrator's. The folder is the service's own.
+    const FileDescriptor parent(::open(stateDirectory_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    if (!parent)
+        return std::unexpected(lastError());
+    return openDirectoryAt(parent.get(), folderName);
+}
+
+std::expected<FileDescriptor, std::error_code> BugCaptureFolder::openOrMake() const
+{
+    auto folder = open();
+    if (folder || folder.error() != std::errc::no_such_file_or_directory)
+        return folder;
+    if (::mkdir(path_.c_str(), permissions) != 0)
+        return std::unexpected(lastError());
+    return open();
+}
+
+void BugCaptureFolder::removeLeftovers(int folder)
+{
+    for (const std::string& name : namesIn(folder, everything).value_or(std::vector<std::string>()))
+        if (name == coming || name == going)
+            static_cast<void>(removeTreeAt(folder, name));
+}
+
+std::error_code BugCaptureFolder::checkFreeSpace() const
+{
+    struct statvfs status = {};
+    if (::statvfs(stateDirectory_.c_str(), &status) != 0)
+        return lastError();
+    const auto free = std::uint64_t{status.f_bavail} * status.f_frsize;
+    return free < limits_.bytesLeftFree ? make_error_code(std::errc::no_space_on_device) : std::error_code();
+}
+
+std::vector<BugCaptureFolder::Capture> BugCaptureFolder::capturesIn(int folder)
+{
+    std::vector<Capture> captures;
+    for (std::string& name : namesIn(folder, everything).value_or(std::vector<std::string>())) {
+        const std::uint64_t number = numberOf(name);
+        if (number == 0)
+            continue;
+        const auto opened = openDirectoryAt(folder, name);
+        if (!opened)
+            continue;
+        const auto state = openDirectoryAt(opened->get(), stateName);
+        captures.push_back(
+            {number, std::move(name), state ? std::optional(bytesOfFilesIn(state->get())) : std::nullopt});
+    }
+    std::ranges::sort(captures, {}, &Capture::number);
+    return captures;
+}
+
+std::expected<std::string, std::error_code> BugCaptureFolder::nextName(double time) const
+{
+    const auto folder = openOrMake();
+    if (!folder)
+        return std::unexpected(folder.error());
+    const auto names = namesIn(folder->get(), everything);
+    if (!names)
+        return std::unexpected(names.error());
+    std::uint64_t highest = 0;
+    for (const std::string& name : *names)
+        highest = std::max(highest, numberOf(name));
+    return fmt::format("{:08}-{}", highest + 1, utcText(time));
+}
+
+// For one capture more, with so many bytes of bulk.
+void BugCaptureFolder::makeRoom(int folder, std::uint64_t bytes) const
+{
+    std::vector<Capture> captures = capturesIn(folder);
+    std::size_t withBulk = 1;
+    for (const Capture& capture : captures) {
+        withBulk += capture.bulk ? 1 : 0;
+        bytes += capture.bulk.value_or(0);
+    }
+    for (const Capture& capture : captures) {
+        if (withBulk <= limits_.mostWithBulk && bytes <= limits_.mostBytes)
+            break;
+        if (!capture.bulk)
+            continue;
+        if (const auto opened = openDirectoryAt(folder, capture.name))
+            remove(opened->get(), stateName, folder);
+        --withBulk;
+        bytes -= *capture.bulk;
+    }
+    const std::size_t most = std::max<std::size_t>(limits_.mostCaptures, 1) - 1;
+    for (std::size_t oldest = 0; captures.size() - oldest > most; ++oldest)
+        remove(folder, captures[oldest].name, folder);
+}
+
+std::error_code BugCaptureFolder::write(int folder, const std::string& hidden, const std::vector<File>& files,
+                                        const std::vector<File>& state) const
+{
+    const auto made = makeDirectoryAt(folder, hidden);
+    if (!made)
+        return made.error();
+    if (!state.empty()) {
+        const auto bulk = makeDirectoryAt(made->get(), stateName);
+        if (!bulk)
+            return bulk.error();
+        if (const auto error = writeAll(bulk->get(), state))
+            return error;
+    }
+    return writeAll(made->get(), files);
+}
+
+std::error_code BugCaptureFolder::add(const std::string& name, const std::vector<File>& files,
+                                      const std::vector<File>& state)
+{
+    const auto folder = openOrMake();
+    if (!folder)
+        return folder.error();
+    std::uint64_t bytes = 0;
+    for (const File& file : state)
+        bytes += file.text.size();
+    const bool isTooMuch = bytes > limits_.mostBytes || limits_.mostWithBulk == 0;
+    makeRoom(folder->get(), isTooMuch ? 0 : bytes);
+
+    const std::string hidden(coming);
+    static_cast<void>(removeTreeAt(folder->get(), hidden)); // of an attempt that failed
+    auto error = write(folder->get(), hidden, files, isTooMuch ? std::vector<File>() : state);
+    if (!error && ::renameat(folder->get(), hidden.c_str(), folder->get(), name.c_str()) != 0)
+        error = lastError();
+    if (error)
+        static_cast<void>(removeTreeAt(folder->get(), hidden));
+    else
+        error = syncDirectory(folder->get());
+    return error;
+}
+
+} // namespace platform

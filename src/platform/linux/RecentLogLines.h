@@ -1,0 +1,42 @@
+// The last lines of the log, kept in memory: when a bug is captured, what the service said just before is half of the
+// evidence, and the journal may belong to somebody else.
+#pragma once
+
+#include "foundation/Mutex.h"
+#include "platform/Log.h"
+
+#include <cstddef>
+#include <deque>
+#include <string>
+#include <string_view>
+
+namespace platform {
+
+// Any thread.
+class RecentLogLines {
+public:
+    // The oldest lines make room for the newest.
+    static constexpr std::size_t mostLines = 500;
+    static constexpr std::size_t mostBytes = std::size_t{64} * 1024; // of their text
+    static constexpr std::size_t longestLine = 4096; // in bytes; of a longer one the beginning is kept
+
+    // A line as it was written, with its prefix, and when it was: seconds since 1970.
+    void add(double time, LogLevel level, std::string_view tag, std::string_view line);
+
+    // A line each, the oldest first: local time, level, tag, and the line.
+    [[nodiscard]] std::string text() const;
+
+private:
+    struct Line {
+        double time;
+        LogLevel level;
+        std::string_view tag; // of a category, which lives as long as the process
+        std::string text;
+    };
+
+    mutable foundation::Mutex lock_;
+    std::deque<Line> lines_ KESTO_GUARDED_BY(lock_);
+    std::size_t bytes_ KESTO_GUARDED_BY(lock_) = 0;
+};
+
+} // namespace platform

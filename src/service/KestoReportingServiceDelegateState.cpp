@@ -1,0 +1,30 @@
+// What a bug capture keeps of the service: how many clients and sessions there are, and of the sessions so many that
+// whoever asks for a snapshot does not feel it.
+#include "client/KestoReportingClientServerInstance.h"
+#include "client/KestoReportingServerQueue.h"
+#include "service/KestoReportingServiceDelegate.h"
+#include "utility/KestoReportingVocabulary.h"
+
+foundation::Value KestoReportingServiceDelegate::stateForBugCapture() const
+{
+    KestoReportingAssertServerQueue();
+    constexpr std::size_t mostShown = 200;
+    std::size_t count = 0;
+    std::vector<foundation::Value> shown;
+    for (const auto& client : clients_) {
+        const std::string processName = client->clientProcessName().value_or(std::string());
+        count += client->clientReportingSessionMap().size();
+        for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
+            if (shown.size() == mostShown)
+                break;
+            const auto service = KestoReportingUtilityGenerateServiceNameFromServiceType(session->serviceType());
+            shown.emplace_back(foundation::Dictionary{{"process", processName},
+                                                      {"pid", client->processIdentifier()},
+                                                      {"reporterID", reporterID},
+                                                      {"service", service},
+                                                      {"started", session->started()}});
+        }
+    }
+    return foundation::Dictionary{
+        {"clients", clients_.size()}, {"sessions", count}, {"shown", foundation::Array(std::move(shown))}};
+}
