@@ -31,9 +31,9 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       deviceProperties_(configurationWatcher_, ProviderLog(log_)),
       fileSystem_(launch.logsDirectory),
       notifications_(notificationsDirectory(launch), configurationWatcher_, ProviderLog(log_)),
+      reportingChannels_(launch.channelRoot, launch.soundRoot, ProviderLog(log_)),
       bugCapture_(launch.stateDirectory, {.log = log_.recentLines(), .clock = clock_, .workQueues = workQueues_},
                   ProviderLog(log_)),
-      reportingChannels_(launch.channelRoot, launch.soundRoot, ProviderLog(log_)),
       analytics_(launch.stateDirectory, configurationWatcher_, clock_, ProviderLog(log_))
 {
     preferences_.setChangeHandler([this](std::string_view domain) {
