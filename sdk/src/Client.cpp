@@ -1,8 +1,9 @@
 #include "Client.h"
 
+#include "BlockedSignals.h"
+
 #include <algorithm>
 #include <cerrno>
-#include <csignal>
 #include <new>
 #include <string>
 #include <sys/eventfd.h>
@@ -15,23 +16,6 @@ std::string_view bytesOf(std::span<const kesto_reporter> reporters) noexcept
 {
     return {reinterpret_cast<const char*>(reporters.data()), reporters.size_bytes()};
 }
-
-// Blocks all signals while it lives, so that a thread that is started meanwhile never handles one.
-class BlockedSignals {
-public:
-    BlockedSignals() noexcept
-    {
-        sigset_t all;
-        sigfillset(&all);
-        pthread_sigmask(SIG_SETMASK, &all, &before_);
-    }
-    ~BlockedSignals() { pthread_sigmask(SIG_SETMASK, &before_, nullptr); }
-    BlockedSignals(const BlockedSignals&) = delete;
-    BlockedSignals& operator=(const BlockedSignals&) = delete;
-
-private:
-    sigset_t before_;
-};
 
 } // namespace
 
@@ -52,7 +36,7 @@ kesto_client::kesto_client(Settings settings, platform::FileDescriptor doorbell)
 
 bool kesto_client::start() noexcept
 try {
-    const BlockedSignals blocked;
+    const libkesto::BlockedSignals blocked;
     const foundation::Lock lock(joining_);
     thread_ = std::thread([this] { run(); });
     return true;

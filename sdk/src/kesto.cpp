@@ -113,7 +113,7 @@ const char* kesto_error_text(kesto_status status)
     case KESTO_OK: return "all is well";
     case KESTO_INVALID_ARGUMENT: return "an argument is invalid";
     case KESTO_OUT_OF_MEMORY: return "there is no memory left";
-    case KESTO_SYSTEM_ERROR: return "the system refused a descriptor or a thread";
+    case KESTO_SYSTEM_ERROR: return "the system refused a descriptor, a thread or a file";
     case KESTO_QUEUE_FULL: return "the queue is full";
     case KESTO_NOT_CONNECTED: return "there is no connection to the service";
     case KESTO_CLOSED: return "the client is closed";

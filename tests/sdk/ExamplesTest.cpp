@@ -88,6 +88,29 @@ protected:
         EXPECT_EQ(*calls[5][2].dictionary()->find("session_output_running"), foundation::Value(false));
     }
 
+    // Runs a driver helper, whose channels must be there as long as it runs.
+    static void expectPublishes(const std::string& program)
+    {
+        const sdk_test::TemporaryDirectory runtime;
+        const std::string tree = runtime / "channels";
+        Process helper({program}, {"KESTO_CHANNEL_ROOT=" + tree, "LD_LIBRARY_PATH=" + library()});
+        EXPECT_EQ(helper.waitForOutput("\n"), "published; press return to take it away\n");
+        EXPECT_EQ(contentOf(tree + "/mixer/Tx/-/late cycles"), "simple\n49\n");
+        EXPECT_EQ(contentOf(tree + "/mixer/Tx/-/cycle time"),
+                  "histogram us\n0 1980\n0 100 5\n100 1000 45\n1000 10000 50\n");
+        EXPECT_THAT(contentOf(tree + "/mixer/Speaker/-/state"), StartsWith("state\nIdle 1 "));
+        helper.write("\n");
+        EXPECT_EQ(helper.wait(), 0);
+        EXPECT_EQ(helper.errors(), "");
+        EXPECT_TRUE(std::filesystem::is_empty(tree));
+    }
+    static std::string contentOf(const std::string& file)
+    {
+        std::ostringstream text;
+        text << std::ifstream(file).rdbuf();
+        return text.str();
+    }
+
     static inline std::unique_ptr<sdk_test::TemporaryDirectory> directory_;
 };
 
@@ -120,6 +143,20 @@ TEST_F(ExamplesTest, ThePlayerInOlderCPlusPlusReports)
              "-Wold-style-cast", "-Wconversion", "-Werror", examples + "/player.cpp", "-o", program},
             {"--cflags", "--libs"});
     expectReports(program);
+}
+
+TEST_F(ExamplesTest, TheDriverHelpersInCAndCPlusPlusPublish)
+{
+    const std::string inC = *directory_ / "driver_c";
+    compile(
+        {KESTO_C_COMPILER, "-std=c11", "-Wall", "-Wextra", "-Wpedantic", "-Werror", examples + "/driver.c", "-o", inC},
+        {"--cflags", "--libs"});
+    expectPublishes(inC);
+    const std::string inCpp = *directory_ / "driver_cpp";
+    compile({KESTO_CXX_COMPILER, "-std=c++17", "-fno-rtti", "-Wall", "-Wextra", "-Wpedantic", "-Wshadow",
+             "-Wold-style-cast", "-Wconversion", "-Werror", examples + "/driver.cpp", "-o", inCpp},
+            {"--cflags", "--libs"});
+    expectPublishes(inCpp);
 }
 
 TEST_F(ExamplesTest, AProjectFindsTheLibraryWithCMake)

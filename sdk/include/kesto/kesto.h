@@ -47,7 +47,7 @@ typedef enum kesto_status {
     KESTO_OK = 0,
     KESTO_INVALID_ARGUMENT = 1, // an argument that no call of this kind may have, such as a null message
     KESTO_OUT_OF_MEMORY = 2,
-    KESTO_SYSTEM_ERROR = 3, // the system had no descriptor or no thread for a client
+    KESTO_SYSTEM_ERROR = 3, // the system had no descriptor, no thread or no file: `errno` says why
     KESTO_QUEUE_FULL = 4, // the client's queue has no room; what was given was not taken
     KESTO_NOT_CONNECTED = 5, // there is no connection, and none is being made; what was given was not taken
     KESTO_CLOSED = 6, // the client has been closed
