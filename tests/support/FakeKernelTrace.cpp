@@ -11,6 +11,9 @@ public:
           session_(std::move(session))
     {
     }
+    ~Handle() override { session_->destroyed = true; }
+    Handle(const Handle&) = delete;
+    Handle& operator=(const Handle&) = delete;
 
     void setCompletionHandler(std::function<void()> handler) override { session_->completion = std::move(handler); }
     void enableWallTimes(bool enabled) override { session_->wallTimes = enabled; }
@@ -29,10 +32,13 @@ public:
     void end() override
     {
         session_->ended = true;
-        if (session_->queue && session_->completion)
+        if (session_->queue && session_->completion && service_.completes)
             session_->queue->submit(session_->completion);
     }
-    [[nodiscard]] std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const override { return timestamp; }
+    [[nodiscard]] std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const override
+    {
+        return service_.toNanoseconds ? service_.toNanoseconds(timestamp) : timestamp;
+    }
 
 private:
     const FakeKernelTrace& service_;
@@ -43,7 +49,8 @@ void FakeKernelTrace::deliver(const platform::KernelTraceEvent& event)
 {
     for (const auto& session : sessions_)
         for (const auto& [firstCode, lastCode, handler] : session->filters)
-            if (session->started && !session->ended && event.code >= firstCode && event.code <= lastCode)
+            if (session->started && !session->ended && !session->destroyed && event.code >= firstCode
+                && event.code <= lastCode)
                 session->queue->submit([handler, event] { handler(event); });
 }
 

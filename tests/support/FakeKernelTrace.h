@@ -1,4 +1,4 @@
-// A kernel trace whose events the test makes up. One nanosecond a unit of time.
+// A kernel trace whose events the test makes up.
 #pragma once
 
 #include "platform/KernelTrace.h"
@@ -21,6 +21,7 @@ public:
         bool wallTimes = false;
         bool started = false;
         bool ended = false;
+        bool destroyed = false;
         std::vector<Filter> filters;
         std::function<void()> completion;
         std::shared_ptr<platform::WorkQueue> queue;
@@ -30,6 +31,10 @@ public:
     bool available = true;
     int filterError = 0;
     int startError = 0;
+    // Whether sessions are completed once they have ended, started or not.
+    bool completes = true;
+    // What a unit of time is; a nanosecond, unless it is set.
+    std::function<std::uint64_t(std::uint64_t)> toNanoseconds;
 
     // The sessions that were made, in order.
     [[nodiscard]] const std::vector<std::shared_ptr<Session>>& sessions() const { return sessions_; }

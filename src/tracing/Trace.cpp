@@ -1,0 +1,32 @@
+// Handing the events round and gathering the results.
+#include "tracing/Trace.h"
+
+#include "utility/KestoReportingLogCategories.h"
+
+void Trace::processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events)
+{
+    std::size_t results = 0;
+    std::size_t leftOut = 0;
+    for (const auto& data : data_) {
+        if (results >= mostResults) {
+            ++leftOut;
+            continue;
+        }
+        data->processTracepoints(session, events);
+        results += data->getResults().size();
+    }
+    if (leftOut != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "trace {} has {} results; {} of its intervals are left out",
+                  name_, results, leftOut);
+}
+
+TraceResults Trace::getResults()
+{
+    for (const auto& data : data_) {
+        if (!data->hasResults())
+            continue;
+        auto& results = resultsByName_[data->name()];
+        results.insert(results.end(), data->getResults().begin(), data->getResults().end());
+    }
+    return resultsByName_;
+}

@@ -1,0 +1,49 @@
+// What a trace measures: each object reads the events of a finished trace, all of them, and keeps the values that it
+// finds there.
+//
+// A trace may hold millions of events and tens of thousands of results. Both are plain data in vectors: reading an
+// event takes some nanoseconds and allocates nothing.
+#pragma once
+
+#include "platform/KernelTrace.h"
+
+#include <cstdint>
+#include <span>
+#include <string>
+#include <utility>
+#include <vector>
+
+using trace_point = platform::KernelTraceEvent;
+
+// One thread at a time.
+class TraceData {
+public:
+    virtual ~TraceData() = default;
+    TraceData(const TraceData&) = delete;
+    TraceData& operator=(const TraceData&) = delete;
+
+    // Appends what the events, which are in the order of time, hold to the results. The session is that which delivered
+    // them: it knows the unit of their time.
+    virtual void processTracepoints(const platform::KernelTraceSession& session,
+                                    std::span<const trace_point> events) = 0;
+
+    [[nodiscard]] const std::string& name() const { return name_; }
+    [[nodiscard]] bool hasResults() const { return !results_.empty(); }
+    // In the order in which they were found.
+    [[nodiscard]] const std::vector<std::uint64_t>& getResults() const { return results_; }
+    // How many intervals were completed.
+    [[nodiscard]] std::uint32_t getNumTimesTraced() const { return numTimesTraced_; }
+    // The sum of the results over the number of intervals; infinity or not a number where no intervals are measured.
+    [[nodiscard]] float getAverageResult() const;
+
+protected:
+    explicit TraceData(std::string name) : name_(std::move(name)) { }
+
+    void addResult(std::uint64_t result) { results_.push_back(result); }
+    void countCompletedInterval() { ++numTimesTraced_; }
+
+private:
+    const std::string name_;
+    std::vector<std::uint64_t> results_;
+    std::uint32_t numTimesTraced_ = 0;
+};

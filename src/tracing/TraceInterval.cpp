@@ -1,0 +1,130 @@
+// Pairing, in one pass over the events. Of each thread only the last start has to be remembered.
+#include "tracing/TraceInterval.h"
+
+#include "utility/KestoReportingLogCategories.h"
+
+namespace {
+
+constexpr std::string_view startsDiscarded =
+    "DISCARDED {} trace Start points for interval {} because no stop points found";
+// Says how many starts were discarded, too: readers of the log know these lines as they are.
+constexpr std::string_view stopsDiscarded =
+    "DISCARDED {} trace Stop points for interval {} because no start points found";
+
+// The last start of each thread that had one. An open-addressed table from which nothing is removed: a thread keeps its
+// place, which its next start is likely to need again.
+class StartsByThread {
+public:
+    struct Start {
+        std::uint64_t thread = 0;
+        std::uint64_t timestamp = 0;
+        bool isPending = false;
+        bool isTaken = false; // the place, by that thread
+    };
+
+    // The thread's place, as long as no other is taken.
+    Start& take(std::uint64_t thread)
+    {
+        if (2 * taken_ >= places_.size())
+            grow();
+        Start& start = find(thread);
+        if (!start.isTaken) {
+            start.thread = thread;
+            start.isTaken = true;
+            ++taken_;
+        }
+        return start;
+    }
+
+    // The thread's place or, if it has none, one that nobody has taken.
+    Start& find(std::uint64_t thread)
+    {
+        constexpr std::uint64_t spread = 0x9E3779B97F4A7C15; // neighbours end far apart
+        std::size_t at = thread * spread >> (64 - placesLog2_);
+        while (places_[at].isTaken && places_[at].thread != thread)
+            at = (at + 1) & (places_.size() - 1);
+        return places_[at];
+    }
+
+private:
+    void grow()
+    {
+        ++placesLog2_;
+        std::vector<Start> old(std::size_t{1} << placesLog2_);
+        old.swap(places_);
+        for (const Start& start : old)
+            if (start.isTaken)
+                find(start.thread) = start;
+    }
+
+    unsigned placesLog2_ = 4;
+    std::vector<Start> places_{std::size_t{1} << placesLog2_};
+    std::size_t taken_ = 0;
+};
+
+} // namespace
+
+void TraceInterval::processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events)
+{
+    if (matchByThread_)
+        processTracepointsSingleThread(session, events);
+    else
+        processTracepointsAnyThread(session, events);
+}
+
+void TraceInterval::processTracepointsSingleThread(const platform::KernelTraceSession& session,
+                                                   std::span<const trace_point> events)
+{
+    StartsByThread starts;
+    std::uint32_t startDiscards = 0;
+    std::uint32_t stopDiscards = 0;
+    for (const trace_point& event : events) {
+        if (event.code == beginCode_) {
+            auto& start = starts.take(event.thread);
+            startDiscards += start.isPending ? 1 : 0;
+            start.isPending = true;
+            start.timestamp = event.timestamp;
+        } else if (event.code == endCode_) {
+            auto& start = starts.find(event.thread);
+            if (start.isPending)
+                complete(session, start.timestamp, event.timestamp);
+            else
+                ++stopDiscards;
+            start.isPending = false;
+        }
+    }
+    if (startDiscards != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Debug, startsDiscarded, startDiscards, name());
+    if (stopDiscards != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Debug, stopsDiscarded, startDiscards, name());
+}
+
+void TraceInterval::processTracepointsAnyThread(const platform::KernelTraceSession& session,
+                                                std::span<const trace_point> events)
+{
+    std::uint64_t start = 0; // none
+    std::uint32_t startDiscards = 0;
+    std::uint32_t stopDiscards = 0;
+    for (const trace_point& event : events) {
+        if (event.code == beginCode_) {
+            startDiscards += start != 0 ? 1 : 0;
+            start = event.timestamp;
+        } else if (event.code == endCode_) {
+            if (start != 0)
+                complete(session, start, event.timestamp);
+            else
+                ++stopDiscards;
+            start = 0;
+        }
+    }
+    if (startDiscards != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Default, startsDiscarded, startDiscards, name());
+    if (stopDiscards != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Default, stopsDiscarded, startDiscards, name());
+}
+
+void TraceInterval::complete(const platform::KernelTraceSession& session, std::uint64_t start, std::uint64_t end)
+{
+    addResult(session.timestampToNanoseconds(end) - session.timestampToNanoseconds(start));
+    countCompletedInterval();
+}

@@ -1,0 +1,146 @@
+// A trace's way: set up, started, ended, completed.
+#include "tracing/TraceRunner.h"
+
+#include "platform/Platform.h"
+#include "tracing/TraceParams.h"
+#include "utility/KestoReportingLogCategories.h"
+
+#include <atomic>
+#include <cassert>
+
+namespace {
+
+// The codes that clients emit for tracing; both ends belong to them.
+constexpr std::uint32_t firstCode = 0x21040000;
+constexpr std::uint32_t lastCode = 0x2104408A;
+
+constinit std::atomic<std::size_t> runners{0};
+
+} // namespace
+
+std::size_t TraceRunner::numberOfRunners() noexcept
+{
+    return runners;
+}
+
+TraceRunner::TraceRunner()
+{
+    platform::WorkQueues& queues = platform::current().workQueues;
+    tracingSemaphore_ = queues.makeSemaphore(0);
+    tracingQueue_ = queues.makeSerialQueue("Tracing Queue", platform::QualityOfService::Default);
+    ++runners;
+}
+
+TraceRunner::~TraceRunner()
+{
+    --runners;
+}
+
+void TraceRunner::createTraceFromTraceParams(const TraceParams* params)
+{
+    if (params == nullptr) {
+        KESTO_LOG(KestoReportingTraceCategory(), Default, "Attempted to add nullptr to trace runner");
+        return;
+    }
+    auto trace = std::make_unique<Trace>(params->name, params->traceType == TraceParams::kernelTrace);
+    for (const auto& point : params->traceDataParams)
+        trace->addTraceDataToCollect(
+            std::make_unique<TraceInterval>(point.name, point.beginCode, point.endCode, point.matchByThread));
+    traceEvents_.emplace(trace.get(), std::make_shared<TraceEvents>());
+    traces_.push_back(std::move(trace));
+}
+
+void TraceRunner::runTraces()
+{
+    KESTO_LOG(KestoReportingTraceCategory(), Info, "Number of traces to perform: {}", traces_.size());
+    for (const auto& trace : traces_) {
+        KESTO_LOG(KestoReportingTraceCategory(), Info, "Performing trace : {}", trace->name());
+        if (!trace->collectKernelTrace())
+            continue;
+        KESTO_LOG(KestoReportingTraceCategory(), Info, "Setting up tracing: {}", trace->name());
+        setupTracing(*trace);
+        KESTO_LOG(KestoReportingTraceCategory(), Info, "Starting tracing: {}", trace->name());
+        startTracing(*trace);
+    }
+}
+
+void TraceRunner::setupTracing(Trace& trace)
+{
+    auto session = platform::current().kernelTrace.createTraceSession();
+    if (!session) {
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "there is no kernel trace; {} collects no events",
+                  trace.name());
+        return;
+    }
+    session->setCompletionHandler([this, &trace] { tracingCompletionHandler(trace); });
+    session->enableWallTimes(true);
+    traceSessions_.insert_or_assign(&trace, std::move(session));
+}
+
+void TraceRunner::startTracing(Trace& trace)
+{
+    const auto session = traceSessions_.find(&trace);
+    if (session == traceSessions_.end())
+        return;
+    const auto append = [events = traceEvents_.at(&trace)](const trace_point& event) { events->append(event); };
+    if (const int error = session->second->filterEventRange(firstCode, lastCode, append); error != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "Could not set up ktrace range, error: {}", error);
+    if (const int error = session->second->start(tracingQueue_); error != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "Could not start ktrace session, error: {}", error);
+}
+
+void TraceRunner::stopTracingandProcessResults()
+{
+    for (const auto& trace : traces_) {
+        KESTO_LOG(KestoReportingTraceCategory(), Info, "Tearing down trace :  {}", trace->name());
+        tracingQueue_->submit([this, &trace = *trace] {
+            if (trace.collectKernelTrace())
+                stopTracing(trace);
+            else
+                tracingCompletionHandler(trace);
+        });
+        tracingSemaphore_->wait();
+        if (trace->collectKernelTrace())
+            traceResults_.try_emplace(trace.get(), trace->getResults());
+        KESTO_LOG(KestoReportingTraceCategory(), Info, "Completed trace.... {},   {} ", completedTraceCount_,
+                  traces_.size());
+    }
+    writeQuilldat();
+}
+
+void TraceRunner::stopTracing(Trace& trace)
+{
+    assert(tracingQueue_->isCurrent());
+    if (const auto session = traceSessions_.find(&trace); session != traceSessions_.end())
+        session->second->end();
+    else
+        tracingCompletionHandler(trace); // nobody else would
+}
+
+void TraceRunner::tracingCompletionHandler(Trace& trace)
+{
+    assert(tracingQueue_->isCurrent());
+    if (trace.collectKernelTrace()) {
+        processEvents(trace);
+        tearDownTracing(trace);
+    }
+    ++completedTraceCount_;
+    tracingSemaphore_->signal();
+}
+
+void TraceRunner::processEvents(Trace& trace)
+{
+    const auto session = traceSessions_.find(&trace);
+    if (session == traceSessions_.end())
+        return;
+    const TraceEvents& events = *traceEvents_.at(&trace);
+    if (events.lost() != 0)
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "trace {} lost {} events for want of memory", trace.name(),
+                  events.lost());
+    trace.processTracepoints(*session->second, events.all());
+}
+
+void TraceRunner::tearDownTracing(Trace& trace)
+{
+    traceSessions_.erase(&trace);
+}

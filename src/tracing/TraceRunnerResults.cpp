@@ -1,0 +1,47 @@
+// The end of a runner's work: a summary of each name in the log, and every value in the results file.
+#define KESTO_LOG_FILE "TraceRunner"
+#include "platform/Platform.h"
+#include "tracing/TraceRunner.h"
+#include "utility/KestoReportingLogCategories.h"
+
+#include <algorithm>
+#include <cstdlib>
+
+std::filesystem::path KestoReportingTracingLogsDirectory()
+{
+    return platform::current().fileSystem.diagnosticLogRoot() / "Audio/Traces";
+}
+
+void TraceRunner::writeQuilldat()
+{
+    constexpr unsigned directoryPermissions = 0777;
+    constexpr int exitStatus = 1;
+    KESTO_LOG(KestoReportingTraceCategory(), Info, "Completed trace....In write perf data.... {}",
+              traceResults_.size());
+    const std::filesystem::path directory = KestoReportingTracingLogsDirectory();
+    if (const auto made = platform::current().fileSystem.createDirectories(directory, directoryPermissions); !made)
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "can't create logging directory at {}: {}", directory.string(),
+                  made.error().message());
+
+    perfWriter_ = platform::current().performanceWriter.open(directory / resultsFileName, projectName, resultsVersion_);
+    if (!perfWriter_) {
+        KESTO_LOG(KestoReportingTraceCategory(), Info, "Failed to open quilldat writer");
+        std::_Exit(exitStatus); // at once: other threads are at work, and what was acknowledged is kept already
+    }
+    for (const auto& traceWithResults : traceResults_) {
+        printTraceResults(traceWithResults);
+        for (const auto& [name, values] : traceWithResults.second)
+            for (const std::uint64_t value : values)
+                perfWriter_->write(name, static_cast<double>(value), platform::PerformanceUnit::Nanoseconds);
+    }
+    perfWriter_.reset();
+}
+
+void TraceRunner::printTraceResults(const TraceWithResults& results)
+{
+    for (const auto& [name, values] : results.second) {
+        const auto [least, most] = std::ranges::minmax(values);
+        KESTO_LOG(KestoReportingTraceCategory(), Info, "Writing out {} result for {}, min: {}, max: {} ", values.size(),
+                  name, least, most);
+    }
+}

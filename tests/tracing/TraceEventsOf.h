@@ -1,0 +1,13 @@
+// Events of a kernel trace in as few words as a test needs.
+#pragma once
+
+#include "tracing/TraceData.h"
+
+namespace support {
+
+inline trace_point eventOf(std::uint32_t code, std::uint64_t timestamp, std::uint64_t thread = 1)
+{
+    return {.timestamp = timestamp, .thread = thread, .code = code};
+}
+
+} // namespace support
