@@ -2,7 +2,6 @@
 #include "client/KestoReportingClientServerInstance.h"
 
 #include "client/KestoReportingServerQueue.h"
-#include "platform/Platform.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -10,8 +9,6 @@
 #include <cstdlib>
 
 namespace {
-constexpr AudioServiceType serviceTypeTest = 11;
-
 bool isRegistered(const KestoReportingServiceDelegateProtocol& delegate,
                   const KestoReportingClientServerInstance& client)
 {
@@ -165,7 +162,7 @@ void KestoReportingClientServerInstance::start(KestoReportingServiceDelegateProt
     session->setTransactionCompleteBlock(reply);
     if (const auto features = delegate.getFeaturesState())
         session->sendMessage(*features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
-    if (platform::current().featureFlags.isEnabled("Sonalis", "Tracing") && session->serviceType() == serviceTypeTest)
+    if (session->mayBeTraced())
         reply(std::nullopt, true);
     logActiveSessions(delegate);
 }

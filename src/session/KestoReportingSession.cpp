@@ -5,10 +5,10 @@
 #include "foundation/Format.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
+#include "tracing/TraceParams.h"
+#include "tracing/TraceRunner.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
-
-const foundation::String KestoReportingTraceTypeKtrace("ktrace");
 
 KestoReportingSession::KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
                                              std::shared_ptr<KestoReportingStorageBudget> budget)
@@ -82,6 +82,7 @@ void KestoReportingSession::start()
         nestedAggregatedPayloadData_ = std::make_unique<KestoReportingMessageStore>(budget_);
     }
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStarted);
+    startTracing();
 }
 
 void KestoReportingSession::stop()
@@ -94,6 +95,7 @@ void KestoReportingSession::stop()
     sendVolumeEvents();
     writeSummaryJson();
     sendSummaryEvent();
+    stopTracing();
     if (messagesLost_ != 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for want of memory", reporterID_,
                   messagesLost_);

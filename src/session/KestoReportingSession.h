@@ -21,6 +21,9 @@
 #include <string_view>
 #include <vector>
 
+struct TraceParams;
+class TraceRunner;
+
 // The one value of "KestoReportingTraceType" that lets a trace start. Told by its identity: text that a client
 // sends never is this object.
 extern const foundation::String KestoReportingTraceTypeKtrace;
@@ -60,6 +63,19 @@ public:
     void start();
     // Ends the run and drops what it recorded. Nothing happens to a session that is not started.
     void stop();
+
+    // Whether sessions of this service type may run kernel traces: those for tests, where the feature is enabled.
+    [[nodiscard]] bool mayBeTraced() const;
+    // Prepares a trace from a trace-parameters file, in the place of one that was prepared or is running. Without a
+    // file nothing changes.
+    void setupTracing(const std::optional<std::string>& fileName);
+    // Whether a trace of this session is running. One that is running when the session goes, goes with it.
+    [[nodiscard]] bool startedTracing() const { return startedTracing_; }
+    // Of the trace that is running or prepared, or was the last.
+    [[nodiscard]] const std::optional<std::string>& tracingFileName() const { return tracingFileName_; }
+    // Of the trace that is running or prepared; null without one.
+    [[nodiscard]] const TraceRunner* traceRunner() const { return traceRunner_.get(); }
+    [[nodiscard]] const TraceParams* traceParams() const { return traceParams_.get(); }
 
     // Normalises and records the message, then calls the reply, if there is one, with no error. `sync` makes no
     // difference: the message is always handled at once on the caller's thread. No message is an empty one.
@@ -127,9 +143,12 @@ private:
     [[nodiscard]] std::string summaryFileName() const;
     void sendVolumeEvents();
     void sendSummaryEvent();
+    void startTracing();
+    void stopTracing();
 
     bool started_ = false;
     bool blinReportingEnabled_ = false;
+    bool startedTracing_ = false;
     std::atomic<AudioServiceType> serviceType_{0};
     foundation::Dictionary configuration_ KESTO_GUARDED_BY(configurationLock_);
     std::optional<KestoReportingDriverSnapShot> driverSnapShot_;
@@ -139,6 +158,9 @@ private:
     std::unique_ptr<KestoReportingMessageStore>
         nestedAggregatedPayloadData_ KESTO_GUARDED_BY(nestedAggregatedPayloadDataLock_);
     std::string_view serviceName_;
+    std::optional<std::string> tracingFileName_;
+    std::unique_ptr<TraceParams> traceParams_;
+    std::unique_ptr<TraceRunner> traceRunner_;
 
     std::shared_ptr<KestoReportingStorageBudget> budget_;
     std::uint64_t messagesLost_ = 0; // in this run, for want of memory

@@ -1,0 +1,74 @@
+// The trace of a session: under which conditions one is run, from the parameters file that the configuration names.
+#define KESTO_LOG_FILE "KestoReportingSession"
+#include "platform/Platform.h"
+#include "session/KestoReportingSession.h"
+#include "tracing/TraceParams.h"
+#include "tracing/TraceParamsParser.h"
+#include "tracing/TraceRunner.h"
+#include "utility/KestoReportingUtility.h"
+
+const foundation::String KestoReportingTraceTypeKtrace("ktrace");
+
+namespace {
+
+constexpr std::string_view traceTypeKey = "KestoReportingTraceType";
+constexpr std::string_view traceFileKey = "KestoReportingPellorinPlistFilePath";
+
+bool allowsKernelTrace(const foundation::Dictionary& configuration)
+{
+    const foundation::Value* type = configuration.find(traceTypeKey);
+    if (type == nullptr)
+        return true;
+    const auto text = type->string();
+    return text && text->isSameObject(KestoReportingTraceTypeKtrace);
+}
+
+} // namespace
+
+bool KestoReportingSession::mayBeTraced() const
+{
+    return serviceType_ == AudioServiceTypeTest && platform::current().featureFlags.isEnabled("Sonalis", "Tracing");
+}
+
+void KestoReportingSession::setupTracing(const std::optional<std::string>& fileName)
+{
+    if (!fileName) {
+        KESTO_LOG(KestoReportingSessionCategory(), Error, "TracefileName empty. Failed to setup tracing");
+        return;
+    }
+    tracingFileName_ = fileName;
+    traceParams_ = TraceParamsParser(*fileName).loadTraceParams();
+    traceRunner_ = std::make_unique<TraceRunner>();
+    traceRunner_->createTraceFromTraceParams(traceParams_.get());
+    startedTracing_ = false;
+    KESTO_LOG(KestoReportingSessionCategory(), Info, "Setting up tracing for {}", serviceName_);
+}
+
+void KestoReportingSession::startTracing()
+{
+    if (!mayBeTraced() || startedTracing_)
+        return;
+    const foundation::Dictionary configuration = this->configuration();
+    const foundation::Value* file = configuration.find(traceFileKey);
+    if (!allowsKernelTrace(configuration) || file == nullptr)
+        return;
+    if (TraceRunner::numberOfRunners() >= TraceRunner::mostAtOnce) {
+        KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} is not traced: {} others are", reporterID_,
+                  TraceRunner::mostAtOnce);
+        return;
+    }
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "Got the tracefile {}, setting up trace", file->text());
+    setupTracing(file->text());
+    startedTracing_ = true;
+    traceRunner_->runTraces();
+}
+
+void KestoReportingSession::stopTracing()
+{
+    if (!mayBeTraced() || !startedTracing_ || !allowsKernelTrace(configuration()))
+        return;
+    startedTracing_ = false;
+    traceRunner_->stopTracingandProcessResults();
+    traceRunner_.reset();
+    traceParams_.reset();
+}
