@@ -1,6 +1,10 @@
 // None of them does anything, but each answers whoever waits for an answer.
 #include "platform/Absent.h"
 
+#include "platform/Platform.h"
+
+#include <utility>
+
 namespace platform {
 
 void AbsentTraceMarkers::emit(std::uint32_t, const std::array<std::uint64_t, 4>&) { }
@@ -40,7 +44,9 @@ public:
     void requestSnapshot(foundation::Dictionary, double, const std::optional<foundation::Value>&,
                          const std::optional<foundation::Value>&, Reply reply) override
     {
-        reply({{"success", false}, {"reason", "this device has no bug-capture service"}});
+        current().workQueues.backgroundQueue().submit([reply = std::move(reply)]() mutable {
+            reply({{"success", false}, {"reason", "this device has no bug-capture service"}});
+        });
     }
 };
 

@@ -32,7 +32,7 @@ private:
     static constexpr ReportingChannelError unavailable = 1;
 };
 
-// Signatures are made; a snapshot is answered at once with a response that says that none was taken.
+// Signatures are made; a snapshot is answered, on the background queue, with a response that says that none was taken.
 class AbsentBugCapture final : public BugCapture {
 public:
     [[nodiscard]] std::unique_ptr<BugCaptureReporter> makeReporter() override;
