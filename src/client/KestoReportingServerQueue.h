@@ -4,6 +4,7 @@
 
 #include "platform/WorkQueue.h"
 
+#include <cassert>
 #include <memory>
 #include <string_view>
 
@@ -14,3 +15,9 @@ void KestoReportingCreateServerQueue();
 
 // The queue. Any thread.
 [[nodiscard]] const std::shared_ptr<platform::WorkQueue>& KestoReportingServerQueue();
+
+// In debug builds, stops whoever calls what belongs on the server queue from elsewhere.
+inline void KestoReportingAssertServerQueue()
+{
+    assert(KestoReportingServerQueue()->isCurrent());
+}

@@ -19,8 +19,10 @@ public:
     virtual ~ProcessTable() = default;
     [[nodiscard]] virtual std::int32_t ownProcessIdentifier() const = 0;
     [[nodiscard]] virtual std::string ownProcessName() const = 0;
-    // The entry of that process, or nothing when there is none.
+    // The entry of that process, or nothing when there is none. May be a moment old.
     [[nodiscard]] virtual std::optional<ProcessTableEntry> entry(std::int32_t processIdentifier) const = 0;
+    // Whatever is remembered of that process is not believed any more: what `entry` tells next is as it is then.
+    virtual void forget(std::int32_t /*processIdentifier*/) { }
 };
 
 } // namespace platform

@@ -29,16 +29,19 @@ std::shared_ptr<KestoReportingServiceDelegate> KestoReportingServiceDelegate::ma
 }
 
 KestoReportingServiceDelegate::KestoReportingServiceDelegate()
-    : features_{{"com.quarn.halden",
-                 "spatial-audio-accessory-feature",
-                 "com.quarn.halden.spatial-audio-accessory-feature.changed",
-                 {}},
-                {std::string(preferencesDomain),
-                 std::string(deviceNameKey),
-                 std::string(gReportingNotifydNotificationName),
-                 {}},
-                {std::nullopt, "ringerstate", "com.quarn.halden.ringerstate", {}}},
-      defaults_(KestoReportingDefaults())
+    : defaults_(KestoReportingDefaults()),
+      features_{{{.defaultsDomain = "com.quarn.halden",
+                  .featureDomain = "spatial-audio-accessory-feature",
+                  .notification = "com.quarn.halden.spatial-audio-accessory-feature.changed",
+                  .notifyToken = {}},
+                 {.defaultsDomain = preferencesDomain,
+                  .featureDomain = deviceNameKey,
+                  .notification = gReportingNotifydNotificationName,
+                  .notifyToken = {}},
+                 {.defaultsDomain = {},
+                  .featureDomain = "ringerstate",
+                  .notification = "com.quarn.halden.ringerstate",
+                  .notifyToken = {}}}}
 {
 }
 
@@ -58,31 +61,38 @@ void KestoReportingServiceDelegate::handleEventForVorp(const foundation::Diction
                                                        const std::shared_ptr<KestoReportingSession>& session,
                                                        const std::string& processName)
 {
+    KestoReportingAssertServerQueue();
     if (KestoReportingUtilityIsInternalBuild())
         vorpStateManager_->handleEvent(message, category, type, session, processName);
 }
 
 void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)
 {
+    KestoReportingAssertServerQueue();
     clients_.push_back(client);
     {
         const foundation::Lock lock(lock_);
         reporterIndex_.registerClient(*client);
     }
     client->setClientStartDate(platform::current().clock.secondsSince1970());
+    platform::current().processTable.forget(client->processIdentifier()); // whoever had the number before it
     client->setClientProcessName(KestoReportingUtilityProcessNameForPID(client->processIdentifier()));
 }
 
 void KestoReportingServiceDelegate::removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)
 {
-    const foundation::Lock lock(lock_);
-    reporterIndex_.unregisterClient(*client);
+    KestoReportingAssertServerQueue();
+    {
+        const foundation::Lock lock(lock_);
+        reporterIndex_.unregisterClient(*client);
+    }
     std::erase(clients_, client);
 }
 
 void KestoReportingServiceDelegate::reporterIDAdded(std::int64_t reporterID,
                                                     const KestoReportingClientServerInstance& client)
 {
+    KestoReportingAssertServerQueue();
     const foundation::Lock lock(lock_);
     reporterIndex_.add(reporterID, client);
 }
@@ -90,12 +100,14 @@ void KestoReportingServiceDelegate::reporterIDAdded(std::int64_t reporterID,
 void KestoReportingServiceDelegate::reporterIDRemoved(std::int64_t reporterID,
                                                       const KestoReportingClientServerInstance& client)
 {
+    KestoReportingAssertServerQueue();
     const foundation::Lock lock(lock_);
     reporterIndex_.remove(reporterID, client);
 }
 
 KestoReportingServiceDelegateProtocol::Sessions KestoReportingServiceDelegate::getAllActiveReportingSessions()
 {
+    KestoReportingAssertServerQueue();
     Sessions active;
     for (const auto& client : getAllClients()) {
         Sessions sessions;
@@ -111,6 +123,7 @@ KestoReportingServiceDelegateProtocol::Sessions KestoReportingServiceDelegate::g
 
 std::shared_ptr<KestoReportingSession> KestoReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID)
 {
+    KestoReportingAssertServerQueue();
     const foundation::Lock lock(lock_);
     if (reporterID == 0 || !reportingEnabled_)
         return nullptr;

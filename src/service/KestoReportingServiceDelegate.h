@@ -11,13 +11,13 @@
 #include "service/KestoReportingReporterIndex.h"
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 
+#include <array>
 #include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
 #include <string_view>
-#include <vector>
 
 // Announces that the service's own preferences changed.
 constexpr std::string_view gReportingNotifydNotificationName = "com.quarn.kesto.reporting";
@@ -63,17 +63,19 @@ private:
     // A device-wide setting that sessions are told. One with a defaults domain is read from the preferences under
     // its own name; one without is the state of its notification.
     struct Feature {
-        std::optional<std::string> defaultsDomain;
-        std::string featureDomain;
-        std::string notification;
+        std::optional<std::string_view> defaultsDomain;
+        std::string_view featureDomain;
+        std::string_view notification;
         std::optional<std::int32_t> notifyToken; // of the registration
     };
+    using Features = std::array<Feature, 3>;
 
     KestoReportingServiceDelegate();
     void listenForFeatureStateChanges();
     void handleFeatureChange(std::int32_t token);
+    [[nodiscard]] Features features() const;
     [[nodiscard]] static std::optional<foundation::Value> valueOf(const Feature& feature);
-    [[nodiscard]] std::string descriptionOfFeatures() const;
+    [[nodiscard]] static std::string descriptionOf(const Features& features);
     [[nodiscard]] foundation::Value stateForBugCapture() const;
     void registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client);
     static void handleInvalidation(std::int32_t processIdentifier,
@@ -83,10 +85,12 @@ private:
     std::atomic<std::int64_t> activeSessionCount_{0};
     Clients clients_;
     std::unique_ptr<KestoReportingDriverUtility> driverUtility_;
-    std::vector<Feature> features_;
     const foundation::Dictionary defaults_;
     std::unique_ptr<KestoReportingUtilityVorpStateManager> vorpStateManager_; // on internal builds only
 
     foundation::Mutex lock_;
     KestoReportingReporterIndex reporterIndex_ KESTO_GUARDED_BY(lock_);
+
+    mutable foundation::Mutex featuresLock_;
+    Features features_ KESTO_GUARDED_BY(featuresLock_);
 };

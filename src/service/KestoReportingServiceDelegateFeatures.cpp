@@ -9,27 +9,40 @@
 
 #include <cmath>
 
+// A name may be posted as soon as it is registered, so the table is read on the server queue while it is filled here.
 void KestoReportingServiceDelegate::listenForFeatureStateChanges()
 {
-    KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "listening for features {}", descriptionOfFeatures());
-    for (Feature& feature : features_) {
+    const Features table = features();
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "listening for features {}", descriptionOf(table));
+    for (std::size_t place = 0; place < table.size(); ++place) {
         const auto [status, token] = platform::current().notifications.registerNotification(
-            feature.notification, KestoReportingServerQueue(), [service = weak_from_this()](std::int32_t changed) {
+            table[place].notification, KestoReportingServerQueue(), [service = weak_from_this()](std::int32_t changed) {
                 if (const auto self = service.lock())
                     self->handleFeatureChange(changed);
             });
-        feature.notifyToken = token;
+        {
+            const foundation::Lock lock(featuresLock_);
+            features_[place].notifyToken = token;
+        }
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "notify setup result {} token {}", status, token);
     }
 }
 
+KestoReportingServiceDelegate::Features KestoReportingServiceDelegate::features() const
+{
+    const foundation::Lock lock(featuresLock_);
+    return features_;
+}
+
 std::optional<foundation::Dictionary> KestoReportingServiceDelegate::getFeaturesState()
 {
+    KestoReportingAssertServerQueue();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "getting features");
     foundation::Dictionary::Entries state;
-    for (const Feature& feature : features_)
+    const Features table = features();
+    for (const Feature& feature : table)
         if (auto value = valueOf(feature))
-            state.push_back({std::string_view(feature.featureDomain), *std::move(value)});
+            state.push_back({feature.featureDomain, *std::move(value)});
     if (state.empty())
         return std::nullopt;
     const platform::Clock& clock = platform::current().clock;
@@ -52,6 +65,7 @@ std::optional<foundation::Value> KestoReportingServiceDelegate::valueOf(const Fe
 
 void KestoReportingServiceDelegate::handleFeatureChange(std::int32_t token)
 {
+    KestoReportingAssertServerQueue();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "feature {} changes", token);
     const auto state = getFeaturesState();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "defaults {}",
@@ -61,17 +75,15 @@ void KestoReportingServiceDelegate::handleFeatureChange(std::int32_t token)
             entry.session->sendMessage(state, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
 }
 
-std::string KestoReportingServiceDelegate::descriptionOfFeatures() const
+std::string KestoReportingServiceDelegate::descriptionOf(const Features& features)
 {
     std::vector<foundation::Value> table;
-    for (const Feature& feature : features_) {
+    for (const Feature& feature : features) {
         foundation::Dictionary::Entries entry;
         if (feature.defaultsDomain)
             entry.push_back({"defaults_domain", *feature.defaultsDomain});
         entry.push_back({"feature_domain", feature.featureDomain});
         entry.push_back({"notification", feature.notification});
-        if (feature.notifyToken)
-            entry.push_back({"notify_token", *feature.notifyToken});
         table.emplace_back(foundation::Dictionary(std::move(entry)));
     }
     return foundation::Value(foundation::Array(std::move(table))).text();

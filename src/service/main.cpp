@@ -7,6 +7,7 @@
 #include "service/KestoReportingServiceDelegate.h"
 #include "utility/KestoReportingLogCategories.h"
 
+#include <csignal>
 #include <cstdio>
 #include <string>
 
@@ -29,12 +30,20 @@ std::expected<platform::ListeningSocket, std::string> takeSocket(platform::Launc
     return *std::move(socket);
 }
 
+// Clients rely on the service by now. What is thrown is no matter of the configuration any more: it ends the process as
+// it would on every other thread, and the service manager starts it again.
+int serve(platform::ConnectionListener& listener) noexcept
+{
+    listener.resume();
+    return 0;
+}
+
 int run()
 {
     auto launch = platform::LaunchConfiguration::fromEnvironment();
     if (!launch)
         return cannotRun(launch.error());
-    auto socket = takeSocket(*launch);
+    auto socket = takeSocket(*launch); // first: a second service gives way before it opens the store of the first
     if (!socket)
         return cannotRun(socket.error());
     auto listener = platform::LinuxConnectionListener::create(*std::move(socket), KestoReportingClientCategory());
@@ -43,17 +52,18 @@ int run()
 
     platform::LinuxPlatform platform(*launch);
     platform::install(platform.platform());
+    (*listener)->setTraceAccess(platform.traceMarkerAccess());
     const auto service = KestoReportingServiceDelegate::make();
     (*listener)->setDelegate(*service);
     (*listener)->setListeningHandler([] { platform::notifyReady("accepting connections"); });
-    (*listener)->resume();
-    return 0;
+    return serve(**listener);
 }
 
 } // namespace
 
 int main()
 {
+    std::signal(SIGPIPE, SIG_IGN); // nobody reads the log any more: no reason to end
     try {
         return run();
     } catch (const std::exception& exception) { // what is thrown before anybody can connect: no memory, no threads

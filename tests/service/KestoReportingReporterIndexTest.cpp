@@ -44,7 +44,7 @@ RC_GTEST_PROP(ReporterIndex, FindsWhatAWalkOverTheRegistryFinds, ())
             chosen->call(what == 'c' ? CreateReportingSession : DestroyReportingSession, reporterID);
         }
         for (std::int64_t other = -2; other < 4; ++other)
-            RC_ASSERT(harness.service->findReportingSessionForID(other) == walk(*harness.service, other));
+            RC_ASSERT(harness.find(other) == walk(*harness.service, other));
     }
 }
 

@@ -77,7 +77,7 @@ TEST_F(ConnectionTest, IsRegisteredBeforeItsFirstCallIsServed)
     const auto connection = accept();
     EXPECT_TRUE(connection->call({1, 1, 42}));
     platform.workQueues.runAll();
-    EXPECT_NE(harness.service->findReportingSessionForID(42), nullptr);
+    EXPECT_NE(harness.find(42), nullptr);
 }
 
 TEST_F(ConnectionTest, HasAClientOfItsOwn)

@@ -61,9 +61,11 @@ TEST(ServiceMaking, ListensForFeaturesAndThenWatchesDrivers)
 
 TEST(ServiceMaking, BeginsWithNoClients)
 {
-    const ServiceHarness harness;
+    ServiceHarness harness;
     EXPECT_THAT(harness.service->getAllClients(), IsEmpty());
-    EXPECT_THAT(harness.service->getAllActiveReportingSessions(), IsEmpty());
+    const auto active =
+        onServerQueue(harness.platform.workQueues, [&] { return harness.service->getAllActiveReportingSessions(); });
+    EXPECT_THAT(active, IsEmpty());
 }
 
 TEST(ServiceMaking, TakesOnNothingOfAServiceThatIsGone)
@@ -144,6 +146,11 @@ TEST(ServiceDefaults, AreReadOnce)
 
 class ServiceTest : public testing::Test {
 protected:
+    KestoReportingServiceDelegate::Sessions activeSessions()
+    {
+        return onServerQueue(platform.workQueues, [&] { return service.getAllActiveReportingSessions(); });
+    }
+
     ServiceHarness harness;
     TestPlatform& platform = harness.platform;
     KestoReportingServiceDelegate& service = *harness.service;
@@ -176,7 +183,7 @@ TEST_F(ServiceTest, FindsNoSessionZeroAndSaysNothing)
     auto player = harness.connect();
     player.call(CreateReportingSession, 0);
     harness.forget();
-    EXPECT_EQ(service.findReportingSessionForID(0), nullptr);
+    EXPECT_EQ(harness.find(0), nullptr);
     EXPECT_THAT(platform.log.lines(), IsEmpty());
 }
 
@@ -185,13 +192,13 @@ TEST_F(ServiceTest, FindsASessionAndSaysWhose)
     auto player = harness.connect();
     player.call(CreateReportingSession, -42);
     harness.forget();
-    EXPECT_EQ(service.findReportingSessionForID(-42), player.session(-42));
+    EXPECT_EQ(harness.find(-42), player.session(-42));
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kers", "found reporting session -42 for client 1001")));
 }
 
 TEST_F(ServiceTest, SaysThatItFindsNone)
 {
-    EXPECT_EQ(service.findReportingSessionForID(42), nullptr);
+    EXPECT_EQ(harness.find(42), nullptr);
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Error, "kers", "failed to find reporting session 42")));
 }
 
@@ -201,15 +208,15 @@ TEST_F(ServiceTest, FindsTheSessionOfTheClientRegisteredFirst)
     auto second = harness.connect();
     second.call(CreateReportingSession, 42); // made before the other's
     first.call(CreateReportingSession, 42);
-    EXPECT_EQ(service.findReportingSessionForID(42), first.session(42));
+    EXPECT_EQ(harness.find(42), first.session(42));
     first.call(DestroyReportingSession, 42);
-    EXPECT_EQ(service.findReportingSessionForID(42), second.session(42));
+    EXPECT_EQ(harness.find(42), second.session(42));
     first.call(CreateReportingSession, 42);
-    EXPECT_EQ(service.findReportingSessionForID(42), first.session(42));
+    EXPECT_EQ(harness.find(42), first.session(42));
     first.close();
-    EXPECT_EQ(service.findReportingSessionForID(42), second.session(42));
+    EXPECT_EQ(harness.find(42), second.session(42));
     second.close();
-    EXPECT_EQ(service.findReportingSessionForID(42), nullptr);
+    EXPECT_EQ(harness.find(42), nullptr);
 }
 
 TEST_F(ServiceTest, FindsTheNewSessionInPlaceOfAReplacedOne)
@@ -217,7 +224,7 @@ TEST_F(ServiceTest, FindsTheNewSessionInPlaceOfAReplacedOne)
     auto player = harness.connect();
     player.call(CreateReportingSession, 42);
     player.call(CreateReportingSession, 42);
-    EXPECT_EQ(service.findReportingSessionForID(42), player.session(42));
+    EXPECT_EQ(harness.find(42), player.session(42));
 }
 
 // --- active sessions
@@ -228,7 +235,7 @@ TEST_F(ServiceTest, HasNoActiveSessionsWhenNoneIsStarted)
     auto recorder = harness.connect();
     player.call(CreateReportingSession, 42);
     harness.forget();
-    EXPECT_THAT(service.getAllActiveReportingSessions(), IsEmpty());
+    EXPECT_THAT(activeSessions(), IsEmpty());
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Default, "kers",
                                    "sessions for client 1001 : [\"reporterID=42,serviceName=(null),ownerPid=1001,"
@@ -249,8 +256,39 @@ TEST_F(ServiceTest, ListsActiveSessionsByClientAndThenByTheirPlaceInTheMap)
     player.call(CreateReportingSession, 3); // keeps its place, and has to be started again
     player.call(StartReportingSessionForID, 3);
     player.call(StopReportingSessionForID, 1);
-    EXPECT_THAT(service.getAllActiveReportingSessions(),
-                ElementsAre(player.session(3), player.session(2), recorder.session(9)));
+    EXPECT_THAT(activeSessions(), ElementsAre(player.session(3), player.session(2), recorder.session(9)));
+}
+
+// --- driver statistics
+
+TEST(ServiceDriverStatistics, AreTakenAndReportedByItsSampler)
+{
+    platform::ReportingChannel underruns;
+    underruns.format = static_cast<std::uint8_t>(platform::ChannelFormat::Simple);
+    underruns.driver = "codec";
+    underruns.group = "Speaker";
+    underruns.subgroup = "DMA";
+    underruns.name = "underruns";
+    underruns.value = 3;
+    ServiceHarness harness([&](TestPlatform& prepared) { prepared.reportingChannels.publish(underruns); });
+    auto player = harness.connect();
+    player.call(CreateReportingSession, 42);
+    player.call(StartReportingSessionForID, 42);
+    const auto session = player.session(42);
+    const auto onQueue = [&](auto work) { return onServerQueue(harness.platform.workQueues, work); };
+
+    const auto snapShot = onQueue([&] { return harness.service->getSnapShot(); });
+    ASSERT_THAT(snapShot, SizeIs(1));
+    EXPECT_EQ(snapShot.begin()->first, "Speaker-(null)");
+    session->setDriverSnapShot(snapShot);
+    underruns.value = 8;
+    harness.platform.reportingChannels.publish(underruns);
+    onQueue([&] { harness.service->sendDriverLogsForSession(session); });
+    const auto messages = session->nestedAggregatedPayloadData().value();
+    ASSERT_THAT(messages, SizeIs(1));
+    const Dictionary told = *messages[0].entries()[0].value.dictionary();
+    ASSERT_TRUE(told.contains("codec_Speaker_DMA_Simple_underruns")) << Value(told).text();
+    EXPECT_EQ(*told.find("codec_Speaker_DMA_Simple_underruns"), Value(5));
 }
 
 // --- the log
@@ -275,7 +313,6 @@ TEST_F(ServiceTest, NamesTheClassOfEachLogLineInWhicheverFileItStands)
 // --- bug capture
 
 constexpr AudioEventType gimbo = 8;
-const Dictionary hapticTime{{"Haptic_Active_Hardware_Time_Seconds", 1}};
 
 TEST_F(ServiceTest, HasNoBugCaptureOutsideInternalBuilds)
 {
@@ -283,29 +320,83 @@ TEST_F(ServiceTest, HasNoBugCaptureOutsideInternalBuilds)
     player.call(CreateReportingSession, 42);
     harness.forget();
     for (const int seconds : {1, 2, 3})
-        service.handleEventForVorp({{"Haptic_Active_Hardware_Time_Seconds", seconds}}, 4, gimbo, player.session(42),
-                                   "player");
+        onServerQueue(platform.workQueues, [&] {
+            service.handleEventForVorp({{"Haptic_Active_Hardware_Time_Seconds", seconds}}, 4, gimbo, player.session(42),
+                                       "player");
+        });
     EXPECT_THAT(platform.log.lines(), IsEmpty());
     EXPECT_EQ(platform.bugCapture.reportersMade(), 0);
 }
 
-TEST(ServiceOfAnInternalBuild, HandsMessagesToTheBugCaptureManager)
+class InternalServiceTest : public testing::Test {
+protected:
+    ServiceHarness harness{[](TestPlatform& prepared) { prepared.deviceProperties.setInternalBuild(true); }};
+    TestPlatform& platform = harness.platform;
+};
+
+TEST_F(InternalServiceTest, HandsMessagesToTheBugCaptureManagerAsTheyAre)
 {
-    ServiceHarness harness([](TestPlatform& platform) { platform.deviceProperties.setInternalBuild(true); });
+    constexpr AudioEventCategory playbackOfTheDSP = 0x10000004;
+    constexpr int serviceHaptics = 3;
     auto player = harness.connect();
     player.call(CreateReportingSession, 42);
+    player.call(SetServiceType, serviceHaptics, 42);
     harness.forget();
-    harness.service->handleEventForVorp(hapticTime, 4, gimbo, player.session(42), "player");
-    EXPECT_THAT(harness.platform.log.lines(), ElementsAre(IsLine(Info, "kerb", "Incrementing Vorp counter. player")));
+    for (const int seconds : {1, 2})
+        onServerQueue(platform.workQueues, [&] {
+            harness.service->handleEventForVorp({{"Haptic_Active_Hardware_Time_Seconds", seconds}}, playbackOfTheDSP,
+                                                gimbo, player.session(42), "player");
+        });
+    ASSERT_THAT(platform.bugCapture.snapshots(), SizeIs(1)) << "the second says something else than the first";
+    const Dictionary& signature = platform.bugCapture.snapshots()[0].signature;
+    EXPECT_EQ(*signature.find("type"), Value("haptics"));
+    EXPECT_EQ(*signature.find("subType"), Value("DSP_Playback"));
+    EXPECT_EQ(*signature.find("detectedProcess"), Value("player"));
 }
 
-TEST(ServiceOfAnInternalBuild, AsksForThatOnceInItsLife)
+TEST_F(InternalServiceTest, TellsBugCapturesOfItsClientsAndTheirSessions)
+{
+    const auto describeState = [this] {
+        return onServerQueue(platform.workQueues, [this] { return platform.bugCapture.describeState(); });
+    };
+    EXPECT_EQ(describeState(), (Dictionary{{"clients", 0}, {"sessions", 0}, {"shown", Array()}}));
+    auto player = harness.connect("player");
+    auto recorder = harness.connect("recorder");
+    player.call(CreateReportingSession, 42);
+    player.call(SetServiceType, 3, 42);
+    player.submit(StartReportingSessionForID, {42});
+    recorder.call(CreateReportingSession, 7);
+    EXPECT_EQ(describeState(),
+              (Dictionary{{"clients", 2},
+                          {"sessions", 2},
+                          {"shown",
+                           Array{Dictionary{{"process", "player"},
+                                            {"pid", ServiceHarness::firstPID},
+                                            {"reporterID", 42},
+                                            {"service", "haptics"},
+                                            {"started", true}},
+                                 Dictionary{{"process", "recorder"},
+                                            {"pid", ServiceHarness::firstPID + 1},
+                                            {"reporterID", 7},
+                                            {"service", "generic"},
+                                            {"started", false}}}}}));
+    for (int reporter = 100; reporter < 400; ++reporter)
+        recorder.call(CreateReportingSession, reporter);
+    const Dictionary state = *describeState().dictionary();
+    EXPECT_EQ(*state.find("sessions"), Value(302));
+    EXPECT_EQ(state.find("shown")->array()->size(), 200U) << "no more than whoever asks can wait for";
+
+    harness.service.reset();
+    EXPECT_EQ(describeState(), Value()) << "nobody is asked who is gone";
+}
+
+TEST(ServiceOfAnInternalBuild, IsOneOrNotForItsWholeLife)
 {
     ServiceHarness harness;
     harness.platform.deviceProperties.setInternalBuild(true);
     auto player = harness.connect();
     player.call(CreateReportingSession, 42);
-    player.call(SendMessage, hapticTime, 4, gimbo, Array{42});
+    player.call(SendMessage, Dictionary{{"Haptic_Active_Hardware_Time_Seconds", 1}}, 4, gimbo, Array{42});
     EXPECT_THAT(harness.platform.log.lines("kerb"), IsEmpty());
     EXPECT_EQ(harness.platform.deviceProperties.timesAsked("InternalBuild"), 1);
 }

@@ -24,7 +24,10 @@ class FeaturesTest : public testing::Test {
 protected:
     explicit FeaturesTest(const std::function<void(TestPlatform&)>& prepare = {}) : harness(prepare) { }
 
-    std::optional<Dictionary> state() { return harness.service->getFeaturesState(); }
+    std::optional<Dictionary> state()
+    {
+        return onServerQueue(platform.workQueues, [&] { return harness.service->getFeaturesState(); });
+    }
     void post(const char* notification)
     {
         platform.notifications.post(notification);
@@ -61,7 +64,8 @@ TEST(FeatureRegistration, ThatFailsIsOnlySaid)
     platform.notifications.setState(accessoryNotification, 1);
     const auto service = KestoReportingServiceDelegate::make();
     EXPECT_THAT(platform.log.lines(), testing::Contains(IsLine(Default, "kers", "notify setup result 9 token 0")));
-    EXPECT_EQ(service->getFeaturesState(), std::nullopt) << "the state of token 0 cannot be read";
+    const auto state = onServerQueue(platform.workQueues, [&] { return service->getFeaturesState(); });
+    EXPECT_EQ(state, std::nullopt) << "the state of token 0 cannot be read";
 }
 
 // --- state

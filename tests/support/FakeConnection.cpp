@@ -16,10 +16,17 @@ std::expected<void, platform::Connection::Violation> FakeConnection::call(Array 
     foundation::appendCbor(Value(std::move(frame)), bytes);
     const auto credit = std::make_shared<char>();
     credits_.push_back(credit);
+    const CallScope scope(*this);
     auto result = callHandler_({decoded(bytes), credit});
     if (!result)
         breakOff();
     return result;
+}
+
+void FakeConnection::resume()
+{
+    EXPECT_TRUE(callHandler_ && interruptionHandler_ && invalidationHandler_) << "what comes at once must be handled";
+    isResumed_ = true;
 }
 
 std::size_t FakeConnection::unansweredCalls() const

@@ -39,7 +39,8 @@ public:
     void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
-    void resume() override { isResumed_ = true; }
+    // All handlers are installed before.
+    void resume() override;
     void send(std::string frame) override;
 
 private:

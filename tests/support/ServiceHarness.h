@@ -7,14 +7,18 @@
 #pragma once
 
 #include "client/KestoReportingClientServerInstance.h"
+#include "client/KestoReportingServerQueue.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "support/FakeConnection.h"
 #include "support/TestPlatform.h"
 
 #include <cstdint>
 #include <functional>
+#include <future>
 #include <memory>
 #include <string>
+#include <type_traits>
+#include <utility>
 #include <vector>
 
 namespace support {
@@ -44,6 +48,16 @@ inline Answers answeredOnce(foundation::Array answer)
     return {std::move(answer)};
 }
 inline const Answers unanswered;
+
+// What the work returns, done where the service does whatever touches clients and sessions.
+template <typename Work> std::invoke_result_t<Work> onServerQueue(FakeWorkQueues& queues, Work work)
+{
+    std::packaged_task<std::invoke_result_t<Work>()> task(std::move(work));
+    auto result = task.get_future();
+    KestoReportingServerQueue()->submit([&task] { task(); });
+    queues.runAll();
+    return result.get();
+}
 
 // A client process. Declared after its service, so that it goes first.
 class TestClient {
@@ -93,6 +107,11 @@ public:
     TestClient connect(std::string processName = "player");
     // Forgets what was logged and traced so far.
     void forget();
+    // Asks the service for a session, as whoever delivers a message does.
+    std::shared_ptr<KestoReportingSession> find(std::int64_t reporterID)
+    {
+        return onServerQueue(platform.workQueues, [&] { return service->findReportingSessionForID(reporterID); });
+    }
 
     TestPlatform platform;
     FakeConnectionListener listener;

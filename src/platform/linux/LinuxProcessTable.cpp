@@ -1,3 +1,5 @@
+// Names from /proc/<pid>/comm. A process's place in the memory of names is its number modulo the size: no list to
+// keep in order, and nothing that clients can make grow.
 #include "platform/linux/LinuxProcessTable.h"
 
 #include "platform/linux/SmallFile.h"
@@ -48,7 +50,7 @@ std::optional<ProcessTableEntry> LinuxProcessTable::entry(std::int32_t processId
         return std::nullopt;
     const std::chrono::nanoseconds now = now_();
     const foundation::Lock lock(lock_);
-    Kept& kept = kept_[static_cast<std::size_t>(processIdentifier) % mostKept];
+    Kept& kept = placeOf(processIdentifier);
     if (kept.entry.processIdentifier != processIdentifier || now - kept.readAt >= longestBelieved) {
         auto name = readName(fmt::to_string(processIdentifier));
         if (!name)
@@ -56,6 +58,13 @@ std::optional<ProcessTableEntry> LinuxProcessTable::entry(std::int32_t processId
         kept = {{processIdentifier, std::move(*name)}, now};
     }
     return kept.entry;
+}
+
+void LinuxProcessTable::forget(std::int32_t processIdentifier)
+{
+    const foundation::Lock lock(lock_);
+    if (Kept& kept = placeOf(processIdentifier); kept.entry.processIdentifier == processIdentifier)
+        kept = {};
 }
 
 } // namespace platform

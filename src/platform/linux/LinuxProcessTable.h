@@ -1,7 +1,7 @@
 // The process table as /proc shows it.
 //
 // The sender's name is asked for with every message, so what was read is believed for a second. That a process
-// changed its name, or that its number went to another, is noticed that much later.
+// changed its name, or that its number went to another, is noticed that much later, unless it is forgotten before.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -27,6 +27,7 @@ public:
     [[nodiscard]] std::string ownProcessName() const override { return ownName_; }
     // The name with a "?" for each byte that is not UTF-8.
     [[nodiscard]] std::optional<ProcessTableEntry> entry(std::int32_t processIdentifier) const override;
+    void forget(std::int32_t processIdentifier) override;
 
     // To the tick, which is much finer than a second and much faster to read than the exact time.
     [[nodiscard]] static std::chrono::nanoseconds coarseMonotonicTime();
@@ -36,6 +37,11 @@ private:
         ProcessTableEntry entry; // of process 0, which there is not, while the place is free
         std::chrono::nanoseconds readAt{};
     };
+
+    [[nodiscard]] Kept& placeOf(std::int32_t processIdentifier) const KESTO_REQUIRES(lock_)
+    {
+        return kept_[static_cast<std::size_t>(processIdentifier) % mostKept];
+    }
 
     const Now now_;
     const std::int32_t ownIdentifier_;

@@ -1,3 +1,4 @@
+// Names of processes, of real ones that bear whatever names a test gives them.
 #include "platform/linux/LinuxProcessTable.h"
 
 #include "foundation/String.h"
@@ -133,6 +134,18 @@ TEST_F(LinuxProcessTableTest, BelievesANameForASecond)
     now += 1s - 1ns;
     EXPECT_EQ(nameOf(process.identifier()), "before");
     now += 1ns;
+    EXPECT_EQ(nameOf(process.identifier()), "after");
+}
+
+TEST_F(LinuxProcessTableTest, ReadsANameAnewThatItWasToldToForget)
+{
+    NamedProcess process("before");
+    EXPECT_EQ(nameOf(process.identifier()), "before");
+    process.rename("after");
+    for (const int unrelated : {process.identifier() + static_cast<int>(LinuxProcessTable::mostKept), 0, -1})
+        table.forget(unrelated);
+    EXPECT_EQ(nameOf(process.identifier()), "before");
+    table.forget(process.identifier());
     EXPECT_EQ(nameOf(process.identifier()), "after");
 }
 
