@@ -1,3 +1,5 @@
+// inotify watches what is there. So what is not there yet is awaited by its name in the nearest directory above, and
+// each time that something of the kind comes or goes, all is looked at anew.
 #include "platform/linux/ConfigurationWatcher.h"
 
 #include "platform/linux/Thread.h"
@@ -19,7 +21,8 @@ namespace fs = std::filesystem;
 // A file counts as changed when who wrote it closes it, not with every piece that is written.
 constexpr std::uint32_t changesOfFiles =
     IN_CLOSE_WRITE | IN_CREATE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_ATTRIB;
-constexpr std::uint32_t writesOfFiles = IN_CLOSE_WRITE | IN_MOVED_TO;
+// A touch changes a file's times and may not even open it.
+constexpr std::uint32_t writesOfFiles = IN_CLOSE_WRITE | IN_MOVED_TO | IN_ATTRIB;
 constexpr std::uint32_t endsOfDirectories = IN_DELETE_SELF | IN_MOVE_SELF;
 
 bool isThere(const fs::path& directory)
@@ -72,14 +75,27 @@ bool ConfigurationWatcher::start()
     return thread_.joinable();
 }
 
-// Anew for everything that is watched: directories are few, and what became of them is not worth telling apart.
-void ConfigurationWatcher::arm()
+// Anew for everything that is watched: directories are few, and what became of them is not worth telling apart. One
+// that is still there is watched without a gap, for the kernel knows it again and gives it the descriptor that it had.
+// Returns the directories whose files were not watched before.
+std::set<fs::path> ConfigurationWatcher::arm()
 {
-    for (const auto& [descriptor, place] : places_)
-        ::inotify_rm_watch(inotify_.get(), descriptor);
-    places_.clear();
+    const auto before = std::exchange(places_, {});
     for (const Watch* watch : watches_)
         armFor(watch->directory_);
+    for (const auto& [descriptor, place] : before)
+        if (!places_.contains(descriptor))
+            ::inotify_rm_watch(inotify_.get(), descriptor);
+
+    std::set<fs::path> added;
+    for (const auto& [descriptor, place] : places_) {
+        const auto known = before.find(descriptor);
+        const bool wasWatched =
+            known != before.end() && known->second.isWanted && known->second.directory == place.directory;
+        if (place.isWanted && !wasWatched)
+            added.insert(place.directory);
+    }
+    return added;
 }
 
 // Watches the directory or, while it is not there, the nearest one above it for the name that is missing.
@@ -137,31 +153,34 @@ void ConfigurationWatcher::handleEvents()
     const ssize_t length = ::read(inotify_.get(), buffer.data(), buffer.size());
     const foundation::Lock lock(lock_);
     bool structureChanged = false;
+    bool eventsWereLost = false;
     for (ssize_t at = 0; at < length;) {
         const auto& event = *reinterpret_cast<const inotify_event*>(buffer.data() + at);
         at += static_cast<ssize_t>(sizeof event + event.len);
         const std::string_view fileName = event.len > 0 ? event.name : "";
         const auto place = places_.find(event.wd);
         if ((event.mask & IN_Q_OVERFLOW) != 0)
-            structureChanged = true;
+            eventsWereLost = true;
         else if (place == places_.end())
             continue; // of a watch that was taken away meanwhile
         else if ((event.mask & (endsOfDirectories | IN_IGNORED | IN_UNMOUNT)) != 0
                  || place->second.awaited.contains(fileName))
             structureChanged = true;
         else if (place->second.isWanted && !fileName.empty())
-            tell(&place->second.directory, fileName, (event.mask & writesOfFiles) != 0);
+            tell(place->second.directory, fileName, (event.mask & writesOfFiles) != 0);
     }
-    if (structureChanged) {
-        arm();
-        tell(nullptr, {}, true);
-    }
+    if (!structureChanged && !eventsWereLost)
+        return;
+    const auto added = arm();
+    for (const Watch* watch : watches_)
+        if (watch->changes_ == Changes::All || eventsWereLost || added.contains(watch->directory_))
+            watch->handler_({});
 }
 
-void ConfigurationWatcher::tell(const fs::path* directory, std::string_view fileName, bool isWrite)
+void ConfigurationWatcher::tell(const fs::path& directory, std::string_view fileName, bool isWrite)
 {
     for (const Watch* watch : watches_)
-        if ((directory == nullptr || watch->directory_ == *directory) && (isWrite || watch->changes_ == Changes::All))
+        if (watch->directory_ == directory && (isWrite || watch->changes_ == Changes::All))
             watch->handler_(fileName);
 }
 

@@ -24,14 +24,14 @@ namespace platform {
 // Any thread, but its own.
 class ConfigurationWatcher {
 public:
-    // Told on the watcher's thread which file of the watched directory may have changed; without a name, that
-    // any of them may have.
+    // Told on the watcher's thread which file of the watched directory may have changed; without a name, that any of
+    // them may have: the directory came to be with whatever is in it, or changes were more than the kernel remembers.
     using Handler = std::function<void(std::string_view fileName)>;
 
     // Which changes of files somebody wants to know.
     enum class Changes : std::uint8_t {
-        All,
-        Writes // that a file was written to its end, or put in place; also when it holds what it held before
+        All, // without a name also when it is merely not known that nothing changed
+        Writes // that a file was written to its end, put in place or touched; also when it holds what it held before
     };
 
     // What somebody watches; it ends with this object, which waits for a handler that is running.
@@ -81,12 +81,12 @@ private:
     };
 
     [[nodiscard]] bool start() KESTO_REQUIRES(lock_);
-    void arm() KESTO_REQUIRES(lock_);
+    std::set<std::filesystem::path> arm() KESTO_REQUIRES(lock_);
     void armFor(const std::filesystem::path& directory) KESTO_REQUIRES(lock_);
     Place* add(std::filesystem::path& directory, std::string& missing) KESTO_REQUIRES(lock_);
     void run();
     void handleEvents();
-    void tell(const std::filesystem::path* directory, std::string_view fileName, bool isWrite) KESTO_REQUIRES(lock_);
+    void tell(const std::filesystem::path& directory, std::string_view fileName, bool isWrite) KESTO_REQUIRES(lock_);
     void complain(std::string_view what, int systemError);
 
     const std::filesystem::path root_;

@@ -1,9 +1,14 @@
+// A post is whatever ends with a file in place: the watcher's word for it is taken, and the state is read only when
+// it is asked for, as it is then.
 #include "platform/linux/LinuxNotifications.h"
 
 #include "platform/linux/SmallFile.h"
 
+#include <cerrno>
 #include <charconv>
 #include <optional>
+#include <sys/stat.h>
+#include <system_error>
 
 namespace platform {
 namespace {
@@ -16,6 +21,17 @@ bool isFileName(std::string_view name) noexcept
     constexpr std::string_view separators("/\0", 2);
     return !name.empty() && name.front() != '.' && name.size() <= longestFileName
         && name.find_first_of(separators) == std::string_view::npos;
+}
+
+// 0, or why there is no such directory.
+int makeDirectory(const std::filesystem::path& path)
+{
+    constexpr mode_t nobodyElseWrites = 0755; // whatever the umask: who writes there decides what sessions are told
+    if (::mkdir(path.c_str(), nobodyElseWrites) == 0)
+        return 0;
+    const int error = errno;
+    std::error_code ignored;
+    return std::filesystem::is_directory(path, ignored) ? 0 : error;
 }
 
 std::optional<std::uint64_t> parseState(std::string_view text) noexcept
@@ -39,8 +55,9 @@ LinuxNotifications::LinuxNotifications(std::filesystem::path directory, Configur
 {
     if (directory_.empty())
         return;
-    if (std::error_code error; !std::filesystem::create_directory(directory_, error) && error)
-        log.error("cannot make {}: {}; notifications will come once it is there", directory_.native(), error.message());
+    if (const int error = makeDirectory(directory_); error != 0)
+        log.error("cannot make {}: {}; notifications will come once it is there", directory_.native(),
+                  std::generic_category().message(error));
     watch_ = watcher.watch(
         directory_, [this](std::string_view fileName) { handleWrite(fileName); },
         ConfigurationWatcher::Changes::Writes);
@@ -49,7 +66,7 @@ LinuxNotifications::LinuxNotifications(std::filesystem::path directory, Configur
 Notifications::Registration LinuxNotifications::registerNotification(std::string_view name,
                                                                      std::shared_ptr<WorkQueue> queue, Handler handler)
 {
-    if (directory_.empty() || !isFileName(name))
+    if (!isFileName(name))
         return {.status = invalidName, .token = 0};
     const foundation::Lock lock(lock_);
     registered_.push_back({std::string(name), std::move(queue), std::move(handler)});
@@ -63,6 +80,8 @@ std::expected<std::uint64_t, NotificationStatus> LinuxNotifications::state(std::
         const foundation::Lock lock(lock_);
         if (token < 1 || static_cast<std::size_t>(token) > registered_.size())
             return std::unexpected(unknownToken);
+        if (directory_.empty())
+            return std::unexpected(noState);
         path = directory_ / registered_[static_cast<std::size_t>(token) - 1].name;
     }
     const auto text = readSmallFile(path, longestState);
@@ -82,7 +101,7 @@ void LinuxNotifications::post(std::string_view name)
     }
 }
 
-// Without a name, the directory itself came to be, with whatever is in it.
+// Without a name, any of the files may have been written.
 void LinuxNotifications::handleWrite(std::string_view fileName)
 {
     if (!fileName.empty())

@@ -20,12 +20,12 @@ namespace platform {
 class LinuxNotifications final : public Notifications {
 public:
     // Statuses other than 0.
-    static constexpr NotificationStatus invalidName = 1; // cannot be the name of a file there, or there is no "there"
+    static constexpr NotificationStatus invalidName = 1; // cannot be the name of a file there
     static constexpr NotificationStatus unknownToken = 2;
     static constexpr NotificationStatus noState = 3; // there is no such file, or it holds no number
 
-    // The directory is made if it is missing, for its owner to write and for all to read. With no directory
-    // nothing can be registered.
+    // The directory is made if it is missing, for nobody but its owner to write. With no directory nothing has a state,
+    // and only `post` posts.
     LinuxNotifications(std::filesystem::path directory, ConfigurationWatcher& watcher, ProviderLog log);
 
     Registration registerNotification(std::string_view name, std::shared_ptr<WorkQueue> queue,

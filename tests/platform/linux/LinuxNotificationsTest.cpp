@@ -1,3 +1,4 @@
+// System notifications as files: what posts a name and what does not, and what is read as its state.
 #include "platform/linux/LinuxNotifications.h"
 
 #include "platform/linux/LinuxWorkQueues.h"
@@ -5,6 +6,7 @@
 #include "support/FakeLog.h"
 
 #include <condition_variable>
+#include <fcntl.h>
 #include <future>
 #include <gtest/gtest.h>
 #include <mutex>
@@ -118,6 +120,48 @@ TEST_F(LinuxNotificationsTest, PostsANameWhoseFileIsReplacedOrWrittenWithTheSame
     EXPECT_EQ(notifications_.state(registration.token), 1U);
 }
 
+TEST_F(LinuxNotificationsTest, PostsANameWhoseFileIsTouchedWithoutBeingOpened)
+{
+    Posts posts;
+    write(ringer, "1");
+    settle();
+    (void)registerName(ringer, posts);
+    ASSERT_EQ(::utimensat(AT_FDCWD, (directory_ / ringer).c_str(), nullptr, 0), 0);
+    settle();
+    EXPECT_EQ(posts.tokens().size(), 1U);
+}
+
+TEST_F(LinuxNotificationsTest, PostsNothingWhenOtherDirectoriesComeAndGo)
+{
+    const auto watch = watcher_.watch("preferences", [](std::string_view) { });
+    write(ringer, "1");
+    settle();
+    Posts posts;
+    (void)registerName(ringer, posts);
+    fs::create_directories(temporary_.path() / "configuration" / "preferences");
+    settle();
+    fs::remove_all(temporary_.path() / "configuration");
+    settle();
+    settle(); // what concerns directories is told after what else came with it
+    EXPECT_TRUE(posts.tokens().empty());
+}
+
+TEST_F(LinuxNotificationsTest, MissesNothingWhileOtherDirectoriesComeAndGo)
+{
+    const auto watch = watcher_.watch("preferences", [](std::string_view) { });
+    Posts posts;
+    (void)registerName(ringer, posts);
+    constexpr std::size_t times = 200;
+    for (std::size_t time = 0; time < times; ++time) {
+        fs::create_directories(temporary_.path() / "configuration" / "preferences");
+        replace(ringer, "1");
+        fs::remove_all(temporary_.path() / "configuration");
+        replace(ringer, "0");
+    }
+    settle();
+    EXPECT_EQ(posts.tokens().size(), 2 * times);
+}
+
 TEST_F(LinuxNotificationsTest, DoesNotPostWhenAFileVanishes)
 {
     write(ringer, "1");
@@ -190,11 +234,33 @@ TEST_F(LinuxNotificationsTest, PostsByHandForChangesThatAreNoFilesOfItsOwn)
     EXPECT_EQ(posts.tokens(), std::vector{registration.token});
 }
 
-TEST_F(LinuxNotificationsTest, RegistersNothingWithoutADirectory)
+TEST_F(LinuxNotificationsTest, PostsByHandWithoutADirectoryToo)
 {
     LinuxNotifications none({}, watcher_, ProviderLog(log_));
     Posts posts;
-    EXPECT_EQ(none.registerNotification(ringer, queue_, posts.handler()).status, LinuxNotifications::invalidName);
+    const auto registration = none.registerNotification(ringer, queue_, posts.handler());
+    EXPECT_EQ(registration.status, 0U);
+    EXPECT_EQ(none.state(registration.token).error(), LinuxNotifications::noState);
+    none.post(ringer);
+    EXPECT_TRUE(posts.waitForMoreThan(0));
+}
+
+TEST_F(LinuxNotificationsTest, LetsNobodyElseWriteWhateverTheUmask)
+{
+    const mode_t umask = ::umask(0);
+    const LinuxNotifications open(temporary_.path() / "open", watcher_, ProviderLog(log_));
+    ::umask(umask);
+    constexpr auto others = fs::perms::group_write | fs::perms::others_write;
+    EXPECT_EQ(fs::status(temporary_.path() / "open").permissions() & others, fs::perms::none);
+}
+
+TEST_F(LinuxNotificationsTest, SaysWhyThereIsNoDirectory)
+{
+    support::writeFile(temporary_.path() / "file", "");
+    const LinuxNotifications broken(temporary_.path() / "file", watcher_, ProviderLog(log_));
+    ASSERT_EQ(log_.lines().size(), 1U);
+    EXPECT_EQ(log_.lines()[0].level, LogLevel::Error);
+    EXPECT_TRUE(log_.lines()[0].message.contains("File exists")) << log_.lines()[0].message;
 }
 
 TEST_F(LinuxNotificationsTest, GoesOnWhenItsDirectoryIsMadeAnew)
