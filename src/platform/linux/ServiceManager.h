@@ -9,7 +9,4 @@ namespace platform {
 // service manager wants to know. Any thread.
 void notifyReady(const std::string& status);
 
-// A new line for people. Any thread.
-void notifyStatus(const std::string& status);
-
 } // namespace platform
