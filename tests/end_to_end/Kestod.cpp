@@ -1,5 +1,8 @@
+// The process gets an environment of its own, nothing of the test's but what sanitizers need, and ends with SIGKILL:
+// what it promises must hold for whoever pulls the plug. What it stored is read as anyone may read it, by SQL.
 #include "end_to_end/Kestod.h"
 
+#include <charconv>
 #include <csignal>
 #include <fcntl.h>
 #include <gtest/gtest.h>
@@ -13,6 +16,10 @@ namespace end_to_end {
 namespace {
 
 namespace fs = std::filesystem;
+
+constexpr int firstPassedDescriptor = 3; // by the protocol of socket activation
+constexpr std::string_view passedTo = "LISTEN_PID=";
+constexpr std::size_t longestPID = 10; // in digits
 
 } // namespace
 
@@ -40,7 +47,7 @@ Kestod::~Kestod()
         std::fprintf(stderr, "--- log of the service:\n%s", log().c_str());
 }
 
-void Kestod::start()
+void Kestod::start(const InheritedDescriptors& inherited)
 {
     std::vector<std::string> variables;
     for (const auto& [name, value] : environment_)
@@ -49,6 +56,10 @@ void Kestod::start()
     for (const char* name : {"ASAN_OPTIONS", "TSAN_OPTIONS", "UBSAN_OPTIONS", "LSAN_OPTIONS", "LD_LIBRARY_PATH"})
         if (const char* value = std::getenv(name))
             variables.push_back(std::string(name) + "=" + value);
+    if (inherited.listeningSocket >= 0) {
+        variables.emplace_back("LISTEN_FDS=1");
+        variables.push_back(std::string(passedTo).append(longestPID, '\0')); // only the process knows its own
+    }
     std::vector<char*> pointers;
     for (std::string& variable : variables)
         pointers.push_back(variable.data());
@@ -57,8 +68,16 @@ void Kestod::start()
     const fs::path logPath = directory() / "log";
     process_ = ::fork();
     if (process_ == 0) {
-        const int log = ::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
-        ::dup2(log, STDERR_FILENO);
+        const bool hasLogFile = inherited.standardError < 0;
+        ::dup2(hasLogFile ? ::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600) : inherited.standardError,
+               STDERR_FILENO);
+        if (inherited.listeningSocket >= 0) {
+            if (::dup2(inherited.listeningSocket, firstPassedDescriptor) == inherited.listeningSocket)
+                ::fcntl(firstPassedDescriptor, F_SETFD, 0);
+            char* digits = variables.back().data() + passedTo.size();
+            std::to_chars(digits, digits + longestPID, ::getpid());
+        }
+        ::signal(SIGPIPE, SIG_DFL); // as a shell starts it, whoever started the test
         char name[] = "kestod";
         char* arguments[] = {name, nullptr};
         ::execve(KESTOD_PATH, arguments, pointers.data());
@@ -103,31 +122,45 @@ std::size_t Kestod::countInLog(std::string_view text) const
     return count;
 }
 
-std::vector<StoredEvent> Kestod::events(std::string_view pattern) const
+std::expected<std::vector<StoredEvent>, std::string> Kestod::readEvents(std::string_view pattern) const
 {
     const fs::path path = directory() / "state" / "analytics.sqlite3";
     std::vector<StoredEvent> events;
     sqlite3* database = nullptr;
     sqlite3_stmt* query = nullptr;
-    if (sqlite3_open_v2(path.c_str(), &database, SQLITE_OPEN_READONLY, nullptr) == SQLITE_OK
-        && sqlite3_prepare_v2(database, "SELECT name, payload FROM events WHERE name GLOB ?1 ORDER BY id", -1, &query,
-                              nullptr)
-            == SQLITE_OK) {
-        sqlite3_bind_text(query, 1, pattern.data(), static_cast<int>(pattern.size()), SQLITE_TRANSIENT);
+    int status = sqlite3_open_v2(path.c_str(), &database, SQLITE_OPEN_READONLY, nullptr);
+    if (status == SQLITE_OK)
+        status = sqlite3_prepare_v2(database, "SELECT name, payload FROM events WHERE name GLOB ?1 ORDER BY id", -1,
+                                    &query, nullptr);
+    if (status == SQLITE_OK)
+        status = sqlite3_bind_text(query, 1, pattern.data(), static_cast<int>(pattern.size()), SQLITE_TRANSIENT);
+    if (status == SQLITE_OK) {
         const auto text = [&](int column) {
             return std::string(reinterpret_cast<const char*>(sqlite3_column_text(query, column)));
         };
-        while (sqlite3_step(query) == SQLITE_ROW)
+        while ((status = sqlite3_step(query)) == SQLITE_ROW)
             events.push_back({text(0), text(1)});
     }
+    const std::string problem = sqlite3_errmsg(database);
     sqlite3_finalize(query);
     sqlite3_close(database);
+    if (status != SQLITE_DONE)
+        return std::unexpected(problem);
     return events;
+}
+
+std::vector<StoredEvent> Kestod::events(std::string_view pattern) const
+{
+    auto events = readEvents(pattern);
+    if (!events)
+        throw std::runtime_error("the store cannot be read: " + events.error());
+    return *std::move(events);
 }
 
 std::vector<StoredEvent> Kestod::waitForEvents(std::string_view pattern) const
 {
-    waitUntil([&] { return !events(pattern).empty(); });
+    waitUntil(
+        [&] { return !readEvents(pattern).value_or(std::vector<StoredEvent>()).empty(); }); // it may not be made yet
     return events(pattern);
 }
 

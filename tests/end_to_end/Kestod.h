@@ -5,6 +5,7 @@
 #include "platform/linux/TemporaryDirectory.h"
 
 #include <chrono>
+#include <expected>
 #include <filesystem>
 #include <map>
 #include <optional>
@@ -37,6 +38,12 @@ struct StoredEvent {
     std::string payload; // JSON
 };
 
+// Descriptors that the process is given in place of its own; -1: none.
+struct InheritedDescriptors {
+    int standardError = -1; // in place of the log file
+    int listeningSocket = -1; // passed as a service manager passes it
+};
+
 // One thread. The process ends with this object, if it has not ended before.
 class Kestod {
 public:
@@ -52,11 +59,13 @@ public:
     Kestod& operator=(const Kestod&) = delete;
 
     // Starts the process; clients that connect at once wait for it.
-    void start();
+    void start(const InheritedDescriptors& inherited = {});
     void kill();
     // Waits for the process to end by itself.
     [[nodiscard]] int exitStatus();
 
+    // Of a process that was started.
+    [[nodiscard]] pid_t process() const { return process_; }
     [[nodiscard]] const std::filesystem::path& directory() const { return directory_.path(); }
     [[nodiscard]] std::filesystem::path socketPath() const { return directory() / "run" / "kesto.socket"; }
     // What the process wrote on standard error so far.
@@ -65,12 +74,14 @@ public:
     [[nodiscard]] bool waitForLog(std::string_view text) const;
     [[nodiscard]] std::size_t countInLog(std::string_view text) const;
 
-    // The stored events of names that match the pattern (GLOB), in order.
+    // The stored events of names that match the pattern (GLOB), in order. Throws when the store cannot be read.
     [[nodiscard]] std::vector<StoredEvent> events(std::string_view pattern = "*") const;
     // Waits until there is such an event.
     [[nodiscard]] std::vector<StoredEvent> waitForEvents(std::string_view pattern) const;
 
 private:
+    [[nodiscard]] std::expected<std::vector<StoredEvent>, std::string> readEvents(std::string_view pattern) const;
+
     const support::TemporaryDirectory directory_;
     Environment environment_;
     pid_t process_ = 0;

@@ -2,10 +2,12 @@
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <unistd.h>
 
 namespace end_to_end {
 namespace {
@@ -14,6 +16,16 @@ using testing::HasSubstr;
 using testing::Not;
 
 constexpr int cannotRun = 78;
+
+platform::FileDescriptor socketBoundTo(const std::string& path, int type)
+{
+    platform::FileDescriptor socket(::socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.copy(address.sun_path, sizeof address.sun_path - 1);
+    EXPECT_EQ(::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    return socket;
+}
 
 struct BadLaunch {
     std::string name;
@@ -63,11 +75,7 @@ TEST(LaunchTest, TellsTheServiceManagerWhenItIsReady)
 {
     const support::TemporaryDirectory directory;
     const std::string path = directory.path() / "notify";
-    const platform::FileDescriptor manager(::socket(AF_UNIX, SOCK_DGRAM | SOCK_CLOEXEC, 0));
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path.copy(address.sun_path, sizeof address.sun_path - 1);
-    ASSERT_EQ(::bind(manager.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    const platform::FileDescriptor manager = socketBoundTo(path, SOCK_DGRAM);
     const timeval timeout{.tv_sec = patience.count(), .tv_usec = 0};
     ::setsockopt(manager.get(), SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
 
@@ -79,6 +87,51 @@ TEST(LaunchTest, TellsTheServiceManagerWhenItIsReady)
     told.resize(static_cast<std::size_t>(count));
     EXPECT_THAT(told, HasSubstr("READY=1"));
     WireClient(kestod.socketPath()).ask(GetAllReporters);
+}
+
+class PassedSocketTest : public testing::Test {
+protected:
+    void SetUp() override
+    {
+        ASSERT_EQ(::listen(socket.get(), SOMAXCONN), 0);
+        kestod.start({.listeningSocket = socket.get()});
+    }
+
+    Kestod kestod{{}, {{"RUNTIME_DIRECTORY", ""}, {"KESTO_SERVICE_NAME", ""}}};
+    const std::filesystem::path path = kestod.directory() / "run" / "passed";
+    const platform::FileDescriptor socket = socketBoundTo(path, SOCK_STREAM);
+};
+
+TEST_F(PassedSocketTest, NeedsNoNameAndNoRuntimeDirectory)
+{
+    EXPECT_EQ(WireClient(path).ask(GetAllReporters), (foundation::Array{1, foundation::Value(), foundation::Array{}}));
+}
+
+TEST_F(PassedSocketTest, WithoutARuntimeDirectoryPreferencesAreToldAllTheSame)
+{
+    WireClient(path).ask(GetAllReporters); // its notifications are registered
+    std::filesystem::create_directory(kestod.directory() / "configuration/preferences");
+    support::replaceFile(kestod.directory() / "configuration/preferences/com.quarn.kesto.toml",
+                         "device_name = \"a\"\n");
+    EXPECT_TRUE(kestod.waitForLog(R"(defaults {"device_name":"a",)"));
+}
+
+TEST(LaunchTest, GoesOnWhenNobodyReadsItsLogAnyMore)
+{
+    int ends[2] = {};
+    ASSERT_EQ(::pipe2(ends, O_CLOEXEC), 0);
+    platform::FileDescriptor reader(ends[0]);
+    platform::FileDescriptor writer(ends[1]);
+    Kestod kestod;
+    kestod.start({.standardError = writer.get()});
+    writer = {};
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    char logged = 0;
+    EXPECT_EQ(::read(reader.get(), &logged, 1), 1);
+    reader = {};
+    client.ask(Create, 2);
+    EXPECT_EQ(client.ask(GetAllReporters), (foundation::Array{3, foundation::Value(), foundation::Array{1, 2}}));
 }
 
 TEST(LaunchTest, BrokenConfigurationIsSaidAndTheServiceRunsWithoutIt)

@@ -1,3 +1,5 @@
+// Blocking, and without anything of the service's own but the encoding of single values: what a foreign client would
+// do. An answer that does not come is an exception, never a test that hangs.
 #include "end_to_end/WireClient.h"
 
 #include "end_to_end/Kestod.h"
