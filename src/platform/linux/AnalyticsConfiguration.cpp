@@ -1,3 +1,5 @@
+// Every key is read by itself, so that one wrong value costs its owner that one setting and a line which says what
+// belongs there.
 #include "platform/linux/AnalyticsConfiguration.h"
 
 #include <algorithm>

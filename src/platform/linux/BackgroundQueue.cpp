@@ -1,3 +1,5 @@
+// One list for all threads; a thread is added only when more items wait than threads are free to take them, and
+// stays.
 #include "platform/linux/BackgroundQueue.h"
 
 #include "platform/linux/Thread.h"

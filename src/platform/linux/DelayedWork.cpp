@@ -1,3 +1,4 @@
+// A schedule ordered by time; the thread wakes for its beginning only, and is woken only by what comes before that.
 #include "platform/linux/DelayedWork.h"
 
 #include "platform/linux/Thread.h"

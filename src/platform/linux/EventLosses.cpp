@@ -1,3 +1,5 @@
+// What was counted and not told yet is told at the end at the latest: no loss goes unsaid because the service went
+// first.
 #include "platform/linux/EventLosses.h"
 
 namespace platform {

@@ -1,3 +1,5 @@
+// What to do when the database cannot do what it should: try again later, set it aside, or count the loss. Nothing
+// here gives up for good.
 #include "platform/linux/EventWriter.h"
 
 #include "foundation/Json.h"

@@ -1,3 +1,4 @@
+// Two cases: a frame that lies whole in what was fed, which is the rule, and one that began in an earlier read.
 #include "platform/linux/FrameReader.h"
 
 #include <algorithm>

@@ -1,3 +1,5 @@
+// Each variable is read to the end whatever came before, and the first problem is kept: so the checks read as a
+// list.
 #include "platform/linux/LaunchConfiguration.h"
 
 #include <cerrno>

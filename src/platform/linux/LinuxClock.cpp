@@ -1,3 +1,4 @@
+// The uptime is CLOCK_BOOTTIME: unlike the monotonic clock, it goes on while the device sleeps.
 #include "platform/linux/LinuxClock.h"
 
 #include <ctime>

@@ -1,3 +1,4 @@
+// A property that is no truth value is read as one, as a preference would be.
 #include "platform/linux/LinuxDeviceProperties.h"
 
 namespace platform {

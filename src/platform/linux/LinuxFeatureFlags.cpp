@@ -1,3 +1,4 @@
+// Whatever is not plainly switched on is off: a flag, a table or a file that is missing or of another kind.
 #include "platform/linux/LinuxFeatureFlags.h"
 
 namespace platform {

@@ -1,3 +1,5 @@
+// Only of a domain whose values are known can be told whether they changed; so whoever wants to be told has all
+// files read that are there, and everything else is read when it is asked for.
 #include "platform/linux/LinuxPreferences.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// Only interactive queues have turns that end in something: other queues store nothing that a client waits for.
 #include "platform/linux/LinuxWorkQueues.h"
 
 #include "foundation/Mutex.h"

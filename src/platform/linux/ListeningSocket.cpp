@@ -1,3 +1,5 @@
+// A socket file that is in the way is removed only if nobody answers behind it: a service that was killed leaves
+// one, and one that runs must not lose its own.
 #include "platform/linux/ListeningSocket.h"
 
 #include "platform/linux/SystemErrorText.h"

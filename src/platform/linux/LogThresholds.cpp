@@ -1,3 +1,4 @@
+// Read item by item; the first that is wrong is named as it was written.
 #include "platform/linux/LogThresholds.h"
 
 #include <algorithm>

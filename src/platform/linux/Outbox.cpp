@@ -1,3 +1,4 @@
+// A list a thread: a turn runs on one thread, so what it sends is gathered without a lock.
 #include "platform/linux/Outbox.h"
 
 #include "platform/linux/FrameReader.h"

@@ -1,3 +1,5 @@
+// Who runs a turn takes it, and gives it back: queue's thread and helpers alike. All that they agree on is in three
+// flags under one lock.
 #include "platform/linux/SerialQueue.h"
 
 #include "foundation/Mutex.h"

@@ -1,3 +1,4 @@
+// The size that the kernel tells is taken for a hint: files of /proc tell none, and others may grow meanwhile.
 #include "platform/linux/SmallFile.h"
 
 #include "platform/linux/FileDescriptor.h"

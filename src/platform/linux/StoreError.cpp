@@ -1,3 +1,4 @@
+// All that an owner is told about the store's troubles, side by side: each with what to do.
 #include "platform/linux/StoreError.h"
 
 namespace platform {

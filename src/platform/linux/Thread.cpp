@@ -1,3 +1,4 @@
+// Nice values, since real-time priorities would let a busy service starve the audio that it reports about.
 #include "platform/linux/Thread.h"
 
 #include <pthread.h>

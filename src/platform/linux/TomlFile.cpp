@@ -1,3 +1,5 @@
+// The only file that sees toml++, which is large and slow to compile, and has to be kept from what it takes for
+// impossible.
 #include "platform/linux/TomlFile.h"
 
 #include "platform/linux/SmallFile.h"

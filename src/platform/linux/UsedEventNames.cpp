@@ -1,3 +1,5 @@
+// Names repeat, patterns rarely change: answers are kept until they do, and all thrown away when there are too many,
+// which costs less than knowing which was used last.
 #include "platform/linux/UsedEventNames.h"
 
 #include "platform/linux/AnalyticsConfiguration.h"

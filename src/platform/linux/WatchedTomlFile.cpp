@@ -1,3 +1,4 @@
+// Watched first and read then, so that no change falls in between.
 #include "platform/linux/WatchedTomlFile.h"
 
 namespace platform {

@@ -1,3 +1,4 @@
+// Which events are wanted and how many are kept: what an owner may write, and what becomes of what is wrong.
 #include "platform/linux/AnalyticsConfiguration.h"
 
 #include "platform/linux/TomlFile.h"

@@ -1,3 +1,5 @@
+// That what is acknowledged is kept: with turns and without, by many threads, beyond the backlog, and when the
+// service is killed. The database is read as any program would read it.
 #include "platform/linux/AnalyticsStore.h"
 
 #include "platform/linux/LinuxWorkQueues.h"

@@ -1,3 +1,5 @@
+// Clients that ask for too much or read too little, and too many of them: each limit holds, costs only whoever met
+// it, and is left again.
 #include "platform/linux/ConnectionHarness.h"
 
 #include <atomic>

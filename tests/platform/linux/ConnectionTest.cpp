@@ -1,3 +1,5 @@
+// Connections over real sockets: calls and answers, every way in which they end, and when the answers of a turn
+// leave.
 #include "platform/linux/ConnectionHarness.h"
 
 #include "platform/linux/Outbox.h"

@@ -1,3 +1,5 @@
+// The database on disks that are full, read-only or damaged, with readers and other writers beside it, and within
+// its bounds: events may be lost, and are counted; the service never is.
 #include "platform/linux/EventWriter.h"
 
 #include "platform/linux/ManualClock.h"

@@ -1,3 +1,5 @@
+// Frames come out as they were sent, however the stream is cut, and nothing is reserved for what a peer only
+// announced.
 #include "platform/linux/FrameReader.h"
 
 #include <gtest/gtest.h>

@@ -1,3 +1,5 @@
+// Lines as they reach a descriptor and a journal, byte for byte, with clients that try to forge them and a journal
+// that is slow or gone.
 #include "platform/linux/LinuxLog.h"
 
 #include "platform/linux/ProviderLog.h"

@@ -1,3 +1,5 @@
+// Configuration that is edited, replaced, moved and broken while it is in use, in all the ways in which editors and
+// people do that; and the watcher that notices it.
 #include "platform/linux/LinuxPreferences.h"
 
 #include "platform/linux/LinuxDeviceProperties.h"

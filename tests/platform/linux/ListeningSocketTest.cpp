@@ -1,3 +1,4 @@
+// Sockets that are bound where others were or are, and sockets that are passed.
 #include "platform/linux/ListeningSocket.h"
 
 #include "platform/linux/TemporaryDirectory.h"

@@ -1,3 +1,4 @@
+// The list of levels in all its forms, and what is said about one that is none.
 #include "platform/linux/LogThresholds.h"
 
 #include <gmock/gmock.h>

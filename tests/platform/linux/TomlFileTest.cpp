@@ -1,3 +1,4 @@
+// TOML as values, and files that are broken for a while.
 #include "platform/linux/TomlFile.h"
 
 #include "platform/linux/TemporaryDirectory.h"

@@ -1,3 +1,5 @@
+// Real threads, which are made to meet at the moments that matter by letting them wait for each other, never for a
+// while.
 #include "platform/linux/LinuxWorkQueues.h"
 #include "platform/linux/SerialQueue.h"
 #include "platform/linux/Thread.h"
