@@ -1,3 +1,5 @@
+// The only file that speaks to the database. SQLite's errors become the few kinds that an owner can do something
+// about.
 #include "platform/linux/EventDatabase.h"
 
 #include <cerrno>

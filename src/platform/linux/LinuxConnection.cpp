@@ -1,3 +1,5 @@
+// One lock a connection, for what it has to write and for how it ends; what only the connection thread touches needs
+// none.
 #include "platform/linux/LinuxConnection.h"
 
 #include "platform/linux/Outbox.h"

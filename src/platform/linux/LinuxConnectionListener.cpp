@@ -1,3 +1,5 @@
+// One loop around epoll. Accepting is part of it, in small helpings, and pauses when descriptors run out, so that
+// neither many new clients nor too many take anything from those that are there.
 #include "platform/linux/LinuxConnectionListener.h"
 
 #include "platform/linux/SerialQueue.h"

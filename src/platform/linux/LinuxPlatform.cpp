@@ -1,3 +1,5 @@
+// The few ties between providers that are otherwise strangers: which preferences post which notification, and what
+// happens at the end of a turn.
 #include "platform/linux/LinuxPlatform.h"
 
 #include "platform/linux/Outbox.h"
@@ -26,11 +28,11 @@ std::filesystem::path notificationsDirectory(const LaunchConfiguration& launch)
 LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
     : log_(launch.logThresholds, LinuxLog::destinationOfThisProcess()),
       configurationWatcher_(launch.configurationDirectory, ProviderLog(log_)),
+      notifications_(notificationsDirectory(launch), configurationWatcher_, ProviderLog(log_)),
       preferences_(configurationWatcher_, ProviderLog(log_)),
       featureFlags_(configurationWatcher_, ProviderLog(log_)),
       deviceProperties_(configurationWatcher_, ProviderLog(log_)),
       fileSystem_(launch.logsDirectory),
-      notifications_(notificationsDirectory(launch), configurationWatcher_, ProviderLog(log_)),
       reportingChannels_(launch.channelRoot, launch.soundRoot, ProviderLog(log_)),
       bugCapture_(launch.stateDirectory, {.log = log_.recentLines(), .clock = clock_, .workQueues = workQueues_},
                   ProviderLog(log_)),

@@ -39,12 +39,12 @@ private:
     LinuxLog log_;
     ConfigurationWatcher configurationWatcher_;
     LinuxClock clock_;
-    LinuxPreferences preferences_;
+    LinuxNotifications notifications_;
+    LinuxPreferences preferences_; // tells through notifications
     LinuxFeatureFlags featureFlags_;
     LinuxDeviceProperties deviceProperties_;
     LinuxProcessTable processTable_;
     LinuxFileSystem fileSystem_;
-    LinuxNotifications notifications_;
     AbsentTraceMarkers traceMarkers_;
     LinuxReportingChannels reportingChannels_;
     LinuxBugCapture bugCapture_;

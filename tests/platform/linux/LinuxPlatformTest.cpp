@@ -1,3 +1,4 @@
+// The providers together: each is made from the launch configuration, and what ties them to each other works.
 #include "platform/linux/LinuxPlatform.h"
 
 #include "platform/linux/StoreReader.h"
