@@ -27,6 +27,15 @@ String::String(std::string_view text)
 {
 }
 
+std::string_view cutBetweenCharacters(std::string_view text, std::size_t longest) noexcept
+{
+    if (text.size() <= longest)
+        return text;
+    while (longest > 0 && (static_cast<std::uint8_t>(text[longest]) & 0xC0) == 0x80)
+        --longest;
+    return text.substr(0, longest);
+}
+
 namespace {
 
 // How many bytes the sequence at the start of `bytes` takes, or 0 when it is not well formed.

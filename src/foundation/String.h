@@ -67,6 +67,9 @@ private:
     Reference<StringObject> object_;
 };
 
+// The text up to so many bytes, and no part of a character.
+[[nodiscard]] std::string_view cutBetweenCharacters(std::string_view text, std::size_t longest) noexcept;
+
 // Whether the bytes are well-formed UTF-8 (RFC 3629: no overlong forms, no surrogates, nothing above
 // U+10FFFF).
 [[nodiscard]] bool isValidUtf8(std::string_view bytes) noexcept;

@@ -42,6 +42,8 @@ public:
         size_ += text.size();
     }
 
+    [[nodiscard]] std::size_t size() const noexcept { return size_; }
+
     void append(char character) { append(std::string_view(&character, 1)); }
 
     // Leaves an empty builder.

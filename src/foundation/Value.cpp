@@ -180,6 +180,33 @@ void Value::appendText(std::string& out) const
     }
 }
 
+namespace {
+constexpr std::size_t bytesOfAnObject = 48; // what a shared object takes beside its content
+}
+
+std::size_t Value::roughBytes() const noexcept
+{
+    switch (kind_) {
+    case Kind::String:
+    case Kind::Data: return sizeof *this + bytesOfAnObject + bytesUnchecked().size();
+    case Kind::Dictionary: return sizeof *this + dictionary()->roughBytes();
+    case Kind::Array: {
+        const Array elements = *array();
+        return std::accumulate(elements.begin(), elements.end(), sizeof *this + bytesOfAnObject,
+                               [](std::size_t bytes, const Value& each) { return bytes + each.roughBytes(); });
+    }
+    default: return sizeof *this;
+    }
+}
+
+std::size_t Dictionary::roughBytes() const noexcept
+{
+    std::size_t bytes = bytesOfAnObject;
+    for (const auto& [key, value] : *this)
+        bytes += bytesOfAnObject + key.view().size() + value.roughBytes();
+    return bytes;
+}
+
 bool operator==(const Value& left, const Value& right) noexcept
 {
     if (left.kind_ != right.kind_)

@@ -88,6 +88,12 @@ public:
     [[nodiscard]] std::optional<Data> data() const noexcept;
     [[nodiscard]] std::optional<Date> date() const noexcept;
 
+    // The number as an integer of that type, or nothing when it is of no integer kind or out of range.
+    template <std::integral Integer> [[nodiscard]] std::optional<Integer> exactly() const noexcept
+    {
+        return kind_ == Kind::Number ? numberUnchecked().exactly<Integer>() : std::nullopt;
+    }
+
     // The characters of a string, without sharing it; nothing of other kinds.
     [[nodiscard]] std::string_view stringView() const noexcept
     {
@@ -105,6 +111,9 @@ public:
     // for null, the base64 of data and the ISO 8601 text of a date.
     [[nodiscard]] std::string text() const;
     void appendText(std::string& out) const;
+
+    // How much memory it takes, roughly, for those who bound that; what it shares with others counts in full.
+    [[nodiscard]] std::size_t roughBytes() const noexcept;
 
     // By content; numbers by value, whatever their kinds.
     friend bool operator==(const Value& left, const Value& right) noexcept;
@@ -222,6 +231,9 @@ public:
     [[nodiscard]] Dictionary with(String key, Value value) const;
     [[nodiscard]] Dictionary without(std::string_view key) const;
     [[nodiscard]] Dictionary mergedWith(const Dictionary& other) const;
+
+    // As of a value.
+    [[nodiscard]] std::size_t roughBytes() const noexcept;
 
     // Whether both are one object, which makes them equal at no cost.
     [[nodiscard]] bool isSameObject(const Dictionary& other) const noexcept

@@ -5,6 +5,8 @@
 // which has the ID; so the clients of an ID are kept in that order.
 #pragma once
 
+#include "foundation/IntegerHash.h"
+
 #include <cstdint>
 #include <map>
 #include <memory>
@@ -51,5 +53,5 @@ private:
 
     Registration nextRegistration_ = 0;
     std::unordered_map<const Client*, Registration> registrationOf_;
-    std::unordered_map<std::int64_t, std::map<Registration, const Client*>> clientsOf_;
+    std::unordered_map<std::int64_t, std::map<Registration, const Client*>, foundation::IntegerHash> clientsOf_;
 };

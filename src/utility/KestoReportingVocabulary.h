@@ -25,6 +25,7 @@ constexpr AudioEventType AudioEventTypeSummary = 11;
 constexpr AudioEventType AudioEventTypeUnknown = 65535;
 constexpr AudioServiceType AudioServiceTypeAlarms = 4;
 constexpr AudioServiceType AudioServiceTypeStandalone = 5;
+constexpr AudioServiceType AudioServiceTypeTest = 11;
 constexpr AudioServiceType AudioServiceTypeUnknown = 65535;
 
 // "Playback"; with a group "DSP_Playback"; with a group that has no name "_Playback".

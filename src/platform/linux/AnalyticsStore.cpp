@@ -1,3 +1,4 @@
+// Batches of events between those who send them and the thread that writes them.
 #include "platform/linux/AnalyticsStore.h"
 
 #include "platform/linux/SerialQueue.h"
@@ -5,46 +6,13 @@
 
 #include <future>
 #include <iterator>
-#include <numeric>
 #include <utility>
 
 namespace platform {
 
-using foundation::Dictionary;
-using foundation::Value;
-
 namespace {
-
 constexpr std::size_t mostRoomKept = 1024; // in events; what a burst needed beyond that is given back
-constexpr std::size_t bytesOfAnObject = 48; // what a shared object takes beside its content
-
-std::size_t roughBytes(const Dictionary& dictionary);
-
-// What a value takes, roughly: the backlog is bounded by it, not accounted to the byte.
-std::size_t roughBytes(const Value& value)
-{
-    std::size_t bytes = sizeof value;
-    if (const auto string = value.string())
-        bytes += bytesOfAnObject + string->view().size();
-    else if (const auto data = value.data())
-        bytes += bytesOfAnObject + data->bytes.view().size();
-    else if (const auto dictionary = value.dictionary())
-        bytes += roughBytes(*dictionary);
-    else if (const auto array = value.array())
-        for (const Value& each : *array)
-            bytes += roughBytes(each);
-    return bytes;
 }
-
-std::size_t roughBytes(const Dictionary& dictionary)
-{
-    std::size_t bytes = bytesOfAnObject;
-    for (const auto& [key, value] : dictionary)
-        bytes += bytesOfAnObject + key.view().size() + roughBytes(value);
-    return bytes;
-}
-
-} // namespace
 
 // --- Batches
 
@@ -53,7 +21,7 @@ void AnalyticsStore::Batch::add(AnalyticsEvent event)
 {
     bytes += sizeof event + event.name.size();
     if (events.empty() || !events.back().payload.isSameObject(event.payload))
-        bytes += roughBytes(event.payload);
+        bytes += event.payload.roughBytes();
     events.push_back(std::move(event));
 }
 
