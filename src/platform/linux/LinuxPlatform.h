@@ -19,6 +19,7 @@
 #include "platform/linux/LinuxFileSystem.h"
 #include "platform/linux/LinuxLog.h"
 #include "platform/linux/LinuxNotifications.h"
+#include "platform/linux/LinuxPerformanceWriter.h"
 #include "platform/linux/LinuxPreferences.h"
 #include "platform/linux/LinuxProcessTable.h"
 #include "platform/linux/LinuxReportingChannels.h"
@@ -49,7 +50,7 @@ private:
     LinuxReportingChannels reportingChannels_;
     LinuxBugCapture bugCapture_;
     AbsentKernelTrace kernelTrace_;
-    AbsentPerformanceWriter performanceWriter_;
+    LinuxPerformanceWriter performanceWriter_;
     AnalyticsStore analytics_;
     LinuxWorkQueues workQueues_; // ends first, for its turns end in the store
 };
