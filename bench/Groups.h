@@ -16,6 +16,7 @@ void measureIdle(const Options& options, Report& report);
 void measureStart(const Options& options, Report& report);
 void measureLogStatement(const Options& options, Report& report);
 void measureClientLibrary(const Options& options, Report& report);
+void measureChannels(const Options& options, Report& report);
 void measureDecoding(const Options& options, Report& report);
 
 } // namespace bench

@@ -31,6 +31,7 @@ constexpr std::array groups{
     Group{"start", "from starting the process to its first answer", measureStart},
     Group{"log", "a log statement below the threshold", measureLogStatement},
     Group{"library", "sending with libkesto, as its caller sees it", measureClientLibrary},
+    Group{"channels", "driver channels: sampled, compared, published", measureChannels},
     Group{"decoding", "CBOR, and keeping a payload", measureDecoding},
 };
 

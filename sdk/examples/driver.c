@@ -59,6 +59,7 @@ int main(void)
     status = kesto_publisher_flush(publisher); // a real helper leaves that to the publisher's thread
 
     puts(status == KESTO_OK ? "published; press return to take it away" : kesto_error_text(status));
+    fflush(stdout);
     getchar();
     kesto_publisher_free(publisher);
     return status == KESTO_OK ? EXIT_SUCCESS : EXIT_FAILURE;

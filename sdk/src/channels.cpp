@@ -16,7 +16,7 @@ using std::chrono::milliseconds;
 
 namespace {
 
-constexpr std::uint32_t defaultWriteInterval = 250;
+constexpr std::uint32_t defaultWriteInterval = 500;
 constexpr std::uint32_t defaultRefreshInterval = 1000;
 
 // What a caller that was built with another version of the header gave, as this version has it.

@@ -3,7 +3,7 @@
 //
 // A channel is a value in this process and a file that shows it to others. To change it is to change the value: a few
 // nanoseconds, without a lock, an allocation or a wait, from any thread. A thread of the publisher writes the files of
-// what has changed, a few times a second at most, each at once: a reader sees the old file or the new one.
+// what has changed, twice a second at most, each at once: a reader sees the old file or the new one.
 //
 //     kesto_publisher *publisher;
 //     kesto_publisher_open(NULL, &publisher);
@@ -43,7 +43,7 @@ typedef struct kesto_publisher_options {
     // count only where the program runs with its user's own privileges.
     const char* root;
     // The least time between two files of one channel. The thread itself makes it longer where there is so much to
-    // write that it would take more than a twentieth of its time. 0: 250 ms.
+    // write that it would take more than a twentieth of its time. 0: 500 ms.
     uint32_t write_interval_ms;
     // A state lasts without anybody touching its channel, so its file is written again after this time. The thread
     // wakes for nothing else. 0: 1 s. UINT32_MAX: never; the file is then true when a state is entered and after

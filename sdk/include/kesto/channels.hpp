@@ -26,7 +26,7 @@ namespace kesto {
 // How a publisher is to be; channels.h says more about each.
 struct PublisherOptions {
     std::string root; // empty: where the service looks by default
-    std::chrono::milliseconds writeInterval{0}; // 0: 250 ms
+    std::chrono::milliseconds writeInterval{0}; // 0: 500 ms
     std::chrono::milliseconds refreshInterval{0}; // 0: 1 s; max(): never
 };
 

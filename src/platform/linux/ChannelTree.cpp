@@ -59,7 +59,9 @@ public:
     {
         for (const Entry& entry : entriesOf(folder)) {
             names_[level] = entry.name;
-            if (level == channelLevel)
+            if (!foundation::isValidUtf8(entry.name))
+                fail("its name is not UTF-8", level);
+            else if (level == channelLevel)
                 readChannel(::dirfd(folder), entry.type);
             else if (isSelected(level) && (entry.type == DT_DIR || entry.type == DT_LNK || entry.type == DT_UNKNOWN))
                 descend(::dirfd(folder), level);
@@ -114,15 +116,12 @@ private:
         }
         if (type != DT_REG && type != DT_UNKNOWN) // to open a device may already do something
             return fail("it is not a regular file");
-        const auto text = readFile(folder);
+        const auto text = readFile(folder, type);
         if (!text)
             return;
-        left_.bytes -= std::min(left_.bytes, text->size());
         auto channel = parseChannelFile(*text);
         if (!channel)
             return fail(description(channel.error()));
-        if (!std::ranges::all_of(names_, foundation::isValidUtf8))
-            return fail("its name is not UTF-8");
         channel->driver = names_[driverLevel];
         channel->group = nameOrNothing(names_[groupLevel]);
         channel->subgroup = nameOrNothing(names_[subgroupLevel]);
@@ -132,39 +131,33 @@ private:
     }
 
     // Valid until the next one; nothing when it cannot be read, which is noted unless it is gone.
-    std::optional<std::string_view> readFile(int folder)
+    std::optional<std::string_view> readFile(int folder, unsigned char type)
     {
         const FileDescriptor file(
             ::openat(folder, names_[channelLevel].c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-        struct stat status = {};
-        if (!file || ::fstat(file.get(), &status) != 0) {
+        if (file && type == DT_UNKNOWN && !isRegular(file.get())) {
+            fail("it is not a regular file");
+            return std::nullopt;
+        }
+        // All that there is, at once: a file in place is replaced and never changed.
+        const ssize_t count = file ? ::read(file.get(), buffer_.data(), buffer_.size()) : -1;
+        if (count < 0) {
             if (errno != ENOENT)
                 fail(systemErrorText(errno));
             return std::nullopt;
         }
-        if (!S_ISREG(status.st_mode))
-            fail("it is not a regular file");
-        else if (static_cast<std::uint64_t>(status.st_size) > largestChannelFile)
-            fail("it is too large");
-        else
-            return readBytes(file.get(), static_cast<std::size_t>(status.st_size));
+        const std::string_view text(buffer_.data(), static_cast<std::size_t>(count));
+        left_.bytes -= std::min(left_.bytes, text.size());
+        if (text.size() <= largestChannelFile)
+            return text;
+        fail("it is too large");
         return std::nullopt;
     }
 
-    // As many as there were when it was opened: a file in place is replaced and never changed.
-    std::optional<std::string_view> readBytes(int file, std::size_t size)
+    static bool isRegular(int file)
     {
-        for (std::size_t length = 0; length < size;) {
-            const ssize_t count = ::read(file, buffer_.data() + length, size - length);
-            if (count < 0 && errno != EINTR) {
-                fail(systemErrorText(errno));
-                return std::nullopt;
-            }
-            if (count == 0)
-                return std::string_view(buffer_.data(), length);
-            length += static_cast<std::size_t>(std::max<ssize_t>(count, 0));
-        }
-        return std::string_view(buffer_.data(), size);
+        struct stat status = {};
+        return ::fstat(file, &status) == 0 && S_ISREG(status.st_mode);
     }
 
     void fail(std::string_view reason, std::size_t level = channelLevel)
@@ -179,7 +172,7 @@ private:
     std::array<std::string, levels> names_; // of the folders on the way, and of the channel
     ChannelReading reading_;
     ChannelTree::Limits left_;
-    std::array<char, largestChannelFile> buffer_;
+    std::array<char, largestChannelFile + 1> buffer_;
 };
 
 } // namespace
