@@ -55,6 +55,22 @@ std::string lineOf(const kesto::Answer& answer)
     return line;
 }
 
+// The library takes calls of a quarter of its queue, and the service of 1 MiB.
+constexpr std::size_t queueBytes = std::size_t{4} * 1024 * 1024;
+// Such a call, escaped as it may be.
+constexpr std::size_t longestLine = std::size_t{8} * 1024 * 1024;
+
+// The next line. Of one that is too long only so much is kept as shows it; false at the end of the input.
+bool readLine(std::istream& input, std::string& line)
+{
+    line.clear();
+    char character = 0;
+    while (input.get(character) && character != '\n')
+        if (line.size() <= longestLine)
+            line += character;
+    return !line.empty() || input;
+}
+
 // How many answers to wait for at the end: a start is answered when its session stops, which need not happen, and
 // the service type of no reporter is answered twice.
 std::size_t awaitedAnswers(const Call& call)
@@ -73,14 +89,16 @@ public:
     {
         kesto::Options options;
         options.socketPath = options_.socket;
+        options.queueBytes = queueBytes;
+        options.wakeOnSend = true; // nobody here minds a system call, and somebody may be waiting
         options.stateChanged = [this](const kesto::StateChange& change) { stateChanged(change); };
         if (const auto status = client_.open(options); status != kesto::Status::Ok) {
             fmt::print(stderr, "kesto client: {}\n", kesto::errorText(status));
             return exitFailure;
         }
         std::string line;
-        for (unsigned number = 1; !isOver() && std::getline(std::cin, line); ++number)
-            if (line.find_first_not_of(" \t\r") != std::string::npos)
+        for (unsigned number = 1; !isOver() && readLine(std::cin, line); ++number)
+            if (line.size() > longestLine || line.find_first_not_of(" \t\r") != std::string::npos)
                 carryOut(line, number);
         waitForAnswers();
         client_.close(std::chrono::milliseconds(0));
@@ -90,7 +108,8 @@ public:
 private:
     void carryOut(std::string_view line, unsigned number)
     {
-        const auto call = parseCall(line);
+        const auto call = line.size() > longestLine ? std::unexpected(fmt::format("longer than {} bytes", longestLine))
+                                                    : parseCall(line);
         if (!call) {
             fmt::print(stderr, "kesto client: line {}: {}\n", number, call.error());
             const std::scoped_lock lock(lock_);
@@ -148,7 +167,8 @@ private:
         changed_.notify_all();
         if (isFinished_ || answer.status() == kesto::Status::ConnectionLost)
             return; // not the service's answers
-        fmt::print("{}\n", lineOf(answer));
+        const std::string line = lineOf(answer) + '\n';
+        std::fwrite(line.data(), 1, line.size(), stdout); // what cannot be written is told at the end
         std::fflush(stdout);
     }
 

@@ -11,5 +11,12 @@ constexpr int exitOk = 0;
 constexpr int exitFailure = 1;
 constexpr int exitUsage = 2;
 
+// That one of the subcommands must be chosen. A word that names none is then told, and not that there is none.
+void requireSubcommand(CLI::App& application);
+
+void addBugsCommand(CLI::App& application, int& exitStatus);
 void addClientCommand(CLI::App& application, int& exitStatus);
 void addEventsCommand(CLI::App& application, int& exitStatus);
+void addNotifyCommand(CLI::App& application, int& exitStatus);
+void addPrefsCommand(CLI::App& application, int& exitStatus);
+void addSummaryCommand(CLI::App& application, int& exitStatus);

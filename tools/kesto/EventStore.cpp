@@ -3,23 +3,41 @@
 #include <array>
 #include <cerrno>
 #include <climits>
-#include <cstdlib>
 #include <fmt/format.h>
+#include <poll.h>
 #include <sqlite3.h>
-#include <stdexcept>
 #include <sys/inotify.h>
+#include <sys/stat.h>
 #include <system_error>
 #include <unistd.h>
+#include <utility>
 
 namespace fs = std::filesystem;
 
 namespace {
 
-constexpr std::string_view databaseName = "analytics.sqlite3";
-
 struct Finalize {
     void operator()(sqlite3_stmt* statement) const { sqlite3_finalize(statement); }
 };
+
+// 0 when there is no such file.
+std::uint64_t fileNumber(const fs::path& path)
+{
+    struct stat status{};
+    return ::stat(path.c_str(), &status) == 0 ? status.st_ino : 0;
+}
+
+// The path as SQLite's URIs have it.
+std::string uriOf(const fs::path& path)
+{
+    std::string uri = "file:";
+    for (const char character : fs::absolute(path).string())
+        if (character == '%' || character == '?' || character == '#')
+            uri += fmt::format("%{:02X}", character);
+        else
+            uri += character;
+    return uri;
+}
 
 std::string columnText(sqlite3_stmt* statement, int column)
 {
@@ -31,24 +49,58 @@ std::string columnText(sqlite3_stmt* statement, int column)
 
 void EventStore::Close::operator()(sqlite3* database) const
 {
-    sqlite3_close(database);
+    sqlite3_close_v2(database); // once its statements are gone
 }
 
-EventStore::EventStore(const fs::path& database)
+EventStore::EventStore(fs::path database) : path_(std::move(database))
 {
-    if (std::error_code error; !fs::exists(database, error))
-        throw std::runtime_error(fmt::format(
-            "there is no event store at {}: has kestod run? Name another with --database", database.string()));
+    std::error_code error;
+    if (!fs::exists(path_, error) && !error)
+        throw EventStoreError(
+            fmt::format("there is no event store at {}: has kestod run? Name another with --database", path_.native()));
+    open();
+}
+
+bool EventStore::isWritten() const
+{
+    std::error_code error;
+    return fs::exists(path_.native() + "-wal", error);
+}
+
+void EventStore::open()
+{
+    isUnchanging_ = !isWritten();
+    const std::uint64_t file = fileNumber(path_);
     sqlite3* opened = nullptr;
-    const int status = sqlite3_open_v2(database.c_str(), &opened, SQLITE_OPEN_READONLY, nullptr);
+    const std::string uri = uriOf(path_) + (isUnchanging_ ? "?immutable=1" : "");
+    const int status = sqlite3_open_v2(uri.c_str(), &opened, SQLITE_OPEN_READONLY | SQLITE_OPEN_URI, nullptr);
     database_.reset(opened);
     if (status != SQLITE_OK)
-        throw std::runtime_error(fmt::format("cannot open {}: {}", database.string(), sqlite3_errmsg(opened)));
+        throw unreadable();
+    file_ = file;
     constexpr int longestWait = 2000; // milliseconds, for a writer that is restarting
     sqlite3_busy_timeout(opened, longestWait);
 }
 
-void EventStore::forEach(const EventFilter& filter, const std::function<void(const StoredEvent&)>& visit) const
+// Says what is wrong with the open database and closes it.
+EventStoreError EventStore::unreadable()
+{
+    EventStoreError error(fmt::format("cannot read the event store {}: {}", path_.native(),
+                                      database_ ? sqlite3_errmsg(database_.get()) : "out of memory"));
+    database_.reset();
+    return error;
+}
+
+bool EventStore::refresh()
+{
+    const std::uint64_t now = fileNumber(path_);
+    const bool isReplaced = now != 0 && now != file_;
+    if (isReplaced || !database_ || (isUnchanging_ && isWritten()))
+        open();
+    return isReplaced;
+}
+
+void EventStore::forEach(const EventFilter& filter, const std::function<void(const StoredEvent&)>& visit)
 {
     constexpr std::string_view query = "SELECT id, time, name, payload FROM ("
                                        " SELECT * FROM events WHERE id > ?1 AND time >= ?2 AND name GLOB ?3"
@@ -58,7 +110,7 @@ void EventStore::forEach(const EventFilter& filter, const std::function<void(con
         sqlite3_prepare_v2(database_.get(), query.data(), static_cast<int>(query.size()), &prepared, nullptr);
     const std::unique_ptr<sqlite3_stmt, Finalize> statement(prepared);
     if (status != SQLITE_OK)
-        throw std::runtime_error(fmt::format("cannot read the event store: {}", sqlite3_errmsg(database_.get())));
+        throw unreadable();
     sqlite3_bind_int64(prepared, 1, filter.afterID);
     sqlite3_bind_double(prepared, 2, filter.since);
     sqlite3_bind_text(prepared, 3, filter.namePattern.data(), static_cast<int>(filter.namePattern.size()),
@@ -69,22 +121,7 @@ void EventStore::forEach(const EventFilter& filter, const std::function<void(con
         visit({sqlite3_column_int64(prepared, 0), sqlite3_column_double(prepared, 1), columnText(prepared, 2),
                columnText(prepared, 3)});
     if (step != SQLITE_DONE)
-        throw std::runtime_error(fmt::format("cannot read the event store: {}", sqlite3_errmsg(database_.get())));
-}
-
-fs::path EventStore::usualPath()
-{
-    const auto environment = [](const char* name) {
-        const char* value = std::getenv(name);
-        return fs::path(value == nullptr ? "" : value);
-    };
-    const fs::path system = fs::path("/var/lib/kesto") / databaseName;
-    const fs::path home = environment("HOME");
-    for (const fs::path& directory : {environment("STATE_DIRECTORY"), environment("XDG_STATE_HOME") / "kesto",
-                                      home / ".local/state/kesto", home / ".config/kesto"})
-        if (std::error_code error; directory.is_absolute() && fs::exists(directory / databaseName, error))
-            return directory / databaseName;
-    return system;
+        throw unreadable();
 }
 
 // The write-ahead log is what changes with every commit, and it may not be there yet: so the directory is watched.
@@ -92,8 +129,8 @@ DatabaseWatch::DatabaseWatch(const fs::path& database) : inotify_(::inotify_init
 {
     const fs::path directory = fs::absolute(database).parent_path();
     if (inotify_ < 0 || ::inotify_add_watch(inotify_, directory.c_str(), IN_MODIFY | IN_CREATE | IN_MOVED_TO) < 0)
-        throw std::runtime_error(
-            fmt::format("cannot follow {}: {}", directory.string(), std::generic_category().message(errno)));
+        throw EventStoreError(
+            fmt::format("cannot follow {}: {}", directory.native(), std::generic_category().message(errno)));
 }
 
 DatabaseWatch::~DatabaseWatch()
@@ -101,8 +138,12 @@ DatabaseWatch::~DatabaseWatch()
     ::close(inotify_);
 }
 
-void DatabaseWatch::wait() const
+bool DatabaseWatch::wait(std::optional<std::chrono::milliseconds> limit) const
 {
-    alignas(inotify_event) std::array<char, sizeof(inotify_event) + NAME_MAX + 1> events;
+    pollfd watched{inotify_, POLLIN, 0};
+    if (::poll(&watched, 1, limit ? static_cast<int>(limit->count()) : -1) <= 0)
+        return false;
+    alignas(inotify_event) std::array<char, 16 * (sizeof(inotify_event) + NAME_MAX + 1)> events;
     static_cast<void>(::read(inotify_, events.data(), events.size()));
+    return true;
 }

@@ -2,20 +2,22 @@
 // are still to come.
 #include "Commands.h"
 #include "EventStore.h"
+#include "JsonReader.h"
 #include "Moment.h"
+#include "Places.h"
+#include "Terminal.h"
 #include "foundation/Json.h"
 #include "foundation/LocalTime.h"
 
-#include <algorithm>
+#include <array>
+#include <chrono>
 #include <cmath>
-#include <cstdlib>
+#include <cstdio>
 #include <fmt/format.h>
-#include <rapidjson/document.h>
-#include <rapidjson/stringbuffer.h>
-#include <rapidjson/writer.h>
+#include <memory>
+#include <optional>
+#include <stdexcept>
 #include <string>
-#include <sys/ioctl.h>
-#include <unistd.h>
 
 namespace {
 
@@ -26,55 +28,6 @@ struct EventsOptions {
     bool isJson = false;
     bool isFollowing = false;
 };
-
-using Json = rapidjson::Value;
-
-// A string as it is, anything else as JSON.
-std::string textOf(const Json& json)
-{
-    if (json.IsString())
-        return {json.GetString(), json.GetStringLength()};
-    rapidjson::StringBuffer buffer;
-    rapidjson::Writer<rapidjson::StringBuffer> writer(buffer);
-    json.Accept(writer);
-    return {buffer.GetString(), buffer.GetSize()};
-}
-
-// Characters that would move the cursor or change colours are not for a terminal.
-std::string printable(std::string text)
-{
-    std::ranges::replace_if(text, [](unsigned char character) { return character < 0x20 || character == 0x7F; }, '?');
-    return text;
-}
-
-// So many columns of text at most; what is cut ends in "…". Every character counts as one column.
-std::string fitted(std::string_view text, std::size_t columns)
-{
-    const auto isStart = [](char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) != 0x80U; };
-    if (static_cast<std::size_t>(std::ranges::count_if(text, isStart)) <= columns)
-        return std::string(text);
-    std::size_t seen = 0;
-    const auto cut = std::ranges::find_if(text, [&](char byte) { return isStart(byte) && ++seen == columns; });
-    return std::string(text.begin(), cut) + "…";
-}
-
-// Pads to the width, in characters.
-std::string padded(std::string text, std::size_t columns)
-{
-    const auto width = static_cast<std::size_t>(
-        std::ranges::count_if(text, [](char byte) { return (static_cast<unsigned char>(byte) & 0xC0U) != 0x80U; }));
-    return text + std::string(columns > width ? columns - width : 0, ' ');
-}
-
-std::size_t terminalWidth()
-{
-    winsize size{};
-    if (::isatty(STDOUT_FILENO) != 0 && ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0)
-        return size.ws_col;
-    if (const char* columns = std::getenv("COLUMNS"))
-        return std::max(40UL, std::strtoul(columns, nullptr, 10));
-    return std::string::npos; // not a terminal: nothing is cut
-}
 
 class Table {
 public:
@@ -93,11 +46,10 @@ public:
         std::string application;
         const std::string payload = describe(event.payload, application);
         const std::size_t used = timeColumns + nameColumns + applicationColumns + 3;
-        const std::size_t rest = width_ == std::string::npos ? width_ : width_ > used + 8 ? width_ - used : 8;
         fmt::print("{} {} {} {}\n", padded(timeText(event.time), timeColumns),
-                   padded(fitted(printable(std::string(name)), nameColumns), nameColumns),
+                   padded(fitted(printable(name), nameColumns), nameColumns),
                    padded(fitted(printable(application), applicationColumns), applicationColumns),
-                   fitted(printable(payload), rest));
+                   fitted(printable(payload), columnsBehind(used, width_)));
     }
 
 private:
@@ -107,6 +59,8 @@ private:
 
     static std::string timeText(double time)
     {
+        if (!std::isfinite(time))
+            return "?";
         return foundation::localTimeText(time, "{:%Y-%m-%d %H:%M:%S}")
             + fmt::format(".{:03}", static_cast<int>((time - std::floor(time)) * 1000));
     }
@@ -114,22 +68,22 @@ private:
     // "key=value key=value", but for the application, which has a column of its own.
     static std::string describe(const std::string& payload, std::string& application)
     {
-        rapidjson::Document document;
-        document.Parse<rapidjson::kParseIterativeFlag>(payload.data(), payload.size());
-        if (document.HasParseError() || !document.IsObject())
+        const auto value = parseJson(payload);
+        const auto entries = value ? value->dictionary() : std::nullopt;
+        if (!entries)
             return payload;
         std::string description;
-        for (const auto& [key, value] : document.GetObject()) {
-            const std::string name = textOf(key);
+        for (const auto& [key, entry] : *entries) {
+            const std::string_view name = key.view();
             if (name == "HostApplicationDisplayID" || name == "processName")
-                application = textOf(value);
+                application = shownText(entry);
             else
-                description += fmt::format("{}{}={}", description.empty() ? "" : " ", name, textOf(value));
+                description += fmt::format("{}{}={}", description.empty() ? "" : " ", name, shownText(entry));
         }
         return description;
     }
 
-    const std::size_t width_ = terminalWidth();
+    const std::size_t width_ = outputWidth();
 };
 
 void printJson(const StoredEvent& event)
@@ -152,15 +106,47 @@ public:
     {
         if (!options_.isJson)
             table_.printHead();
-        print();
+        if (filter_.mostRecent == 0)
+            passOver();
+        else
+            print();
         if (!options_.isFollowing)
             return;
         filter_.mostRecent.reset();
-        for (const DatabaseWatch watch(options_.database);; watch.wait())
-            print();
+        follow();
     }
 
 private:
+    // Makes all that is there count as seen.
+    void passOver()
+    {
+        filter_.mostRecent = 1;
+        store_.forEach(filter_, [this](const StoredEvent& event) { filter_.afterID = event.id; });
+    }
+
+    // The log is written first, and only then the commit can be seen, on a slow disk much later: so after each change
+    // it is looked a few times. A store that is just being made cannot be read yet; only if that lasts it is an error.
+    [[noreturn]] void follow()
+    {
+        using std::chrono::milliseconds;
+        constexpr std::array<milliseconds, 5> pauses{milliseconds(10), milliseconds(50), milliseconds(250),
+                                                     milliseconds(1000), milliseconds(5000)};
+        const DatabaseWatch watch(options_.database);
+        for (std::size_t looks = 0;;) {
+            try {
+                if (store_.refresh())
+                    filter_.afterID = 0;
+                print();
+            } catch (const EventStoreError&) {
+                if (looks == pauses.size())
+                    throw;
+            }
+            const bool isChanged =
+                watch.wait(looks < pauses.size() ? std::optional(pauses[looks]) : std::optional<milliseconds>());
+            looks = isChanged ? 0 : looks + 1;
+        }
+    }
+
     void print()
     {
         store_.forEach(filter_, [this](const StoredEvent& event) {
@@ -170,7 +156,8 @@ private:
             else
                 table_.print(event);
         });
-        std::fflush(stdout);
+        if (std::fflush(stdout) != 0)
+            throw std::runtime_error("the output could not be written");
     }
 
     const EventsOptions& options_;
@@ -196,7 +183,7 @@ void addEventsCommand(CLI::App& application, int& exitStatus)
     command->add_flag("--json", options->isJson, "One JSON object a line, for programs");
     command->callback([options, &exitStatus] {
         if (options->database.empty())
-            options->database = EventStore::usualPath();
+            options->database = usualDatabase();
         if (!options->since.empty()) {
             const auto since = parseMoment(options->since);
             if (!since)

@@ -29,18 +29,28 @@ std::optional<double> parseAgo(std::string_view text)
     }
 }
 
-std::optional<double> parseTime(std::string text)
+bool isDay(const std::tm& time)
 {
-    const bool isUtc = text.ends_with('Z');
-    if (isUtc)
-        text.pop_back();
+    using namespace std::chrono;
+    return (year(time.tm_year + 1900) / (time.tm_mon + 1) / time.tm_mday).ok();
+}
+
+std::optional<double> parseTime(const std::string& text)
+{
     for (const char* format :
          std::array{"%Y-%m-%dT%H:%M:%S", "%Y-%m-%d %H:%M:%S", "%Y-%m-%dT%H:%M", "%Y-%m-%d %H:%M", "%Y-%m-%d"}) {
         std::tm time{};
         time.tm_isdst = -1; // whatever holds at that time
         const char* end = ::strptime(text.c_str(), format, &time);
-        if (end != nullptr && *end == '\0')
-            return static_cast<double>(isUtc ? ::timegm(&time) : std::mktime(&time));
+        if (end == nullptr || !isDay(time))
+            continue;
+        if (*end == '\0')
+            return static_cast<double>(std::mktime(&time));
+        end = ::strptime(end, "%z", &time);
+        if (end == nullptr || *end != '\0')
+            continue;
+        const auto offset = time.tm_gmtoff; // which `timegm` forgets
+        return static_cast<double>(::timegm(&time) - offset);
     }
     return std::nullopt;
 }

@@ -4,17 +4,33 @@
 #include <CLI/Error.hpp>
 #include <cstdio>
 #include <exception>
+#include <stdexcept>
+
+void requireSubcommand(CLI::App& application)
+{
+    application.require_subcommand(0, 1);
+    application.callback([&application] {
+        if (application.get_subcommands().empty())
+            throw CLI::RequiredError::Subcommand(1);
+    });
+}
 
 int main(int argumentCount, char** arguments)
 {
-    CLI::App application("Talks to the audio reporting service and shows what it stored.", "kesto");
+    CLI::App application("Talks to the audio reporting service and shows what it found out.", "kesto");
     application.set_version_flag("--version", "kesto " KESTO_VERSION);
-    application.require_subcommand(1);
+    requireSubcommand(application);
     int exitStatus = exitOk;
+    addBugsCommand(application, exitStatus);
     addClientCommand(application, exitStatus);
     addEventsCommand(application, exitStatus);
+    addNotifyCommand(application, exitStatus);
+    addPrefsCommand(application, exitStatus);
+    addSummaryCommand(application, exitStatus);
     try {
         application.parse(argumentCount, arguments);
+        if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0)
+            throw std::runtime_error("the output could not be written");
         return exitStatus;
     } catch (const CLI::ParseError& error) {
         return application.exit(error) == 0 ? exitOk : exitUsage; // help and version come this way, too

@@ -1,0 +1,45 @@
+// The tool as it is shipped, in an environment of its own that names the directories of one service.
+#pragma once
+
+#include "platform/linux/TemporaryDirectory.h"
+#include "sdk/Process.h"
+
+#include <filesystem>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace kesto_tool {
+
+using sdk_test::Finished;
+using sdk_test::Process;
+
+// One thread.
+class Tool {
+public:
+    using Arguments = std::vector<std::string>;
+
+    // The directories are run, state and configuration below that root; times are in UTC.
+    explicit Tool(const std::filesystem::path& root);
+
+    // "NAME=value", or "NAME" to have no such variable.
+    void setVariable(const std::string& variable) { environment_.push_back(variable); }
+    // From now on the tool has no rights of its own, as far as that can be; the root's directories are open to it.
+    void giveUpRights() { hasRights_ = false; }
+
+    // To its end, with that input.
+    [[nodiscard]] Finished run(const Arguments& arguments, const std::string& input = {}) const;
+    // What it prints when it must succeed and has nothing to complain about.
+    [[nodiscard]] std::string print(const Arguments& arguments, const std::string& input = {}) const;
+    [[nodiscard]] std::unique_ptr<Process> start(const Arguments& arguments) const;
+    // By a shell, with the program's path as $kesto.
+    [[nodiscard]] Finished runShell(const std::string& script) const;
+
+private:
+    [[nodiscard]] Process::Arguments command(const Arguments& arguments) const;
+
+    Process::Environment environment_;
+    bool hasRights_ = true;
+};
+
+} // namespace kesto_tool

@@ -1,0 +1,64 @@
+#include "Places.h"
+
+#include <cstdlib>
+#include <initializer_list>
+#include <string_view>
+#include <system_error>
+
+namespace fs = std::filesystem;
+
+namespace {
+
+std::string_view environment(const char* name)
+{
+    const char* value = std::getenv(name);
+    return value == nullptr ? "" : value;
+}
+
+// Of the user's directories the first counts that holds that file; an empty name stands for the directory itself.
+fs::path usualDirectory(const char* variable, std::initializer_list<fs::path> ofUser, const fs::path& ofSystem,
+                        const fs::path& file = {})
+{
+    if (const std::string_view value = environment(variable); !value.empty())
+        return fs::absolute(value.substr(0, value.find(':'))); // systemd passes several when a unit has several
+    for (const fs::path& directory : ofUser)
+        if (std::error_code error; directory.is_absolute() && fs::exists(directory / file, error))
+            return directory;
+    return ofSystem;
+}
+
+} // namespace
+
+fs::path usualDatabase()
+{
+    const fs::path name = "analytics.sqlite3";
+    const fs::path home = environment("HOME");
+    // The last is where the service manager of a user kept state before version 254.
+    return usualDirectory("STATE_DIRECTORY",
+                          {fs::path(environment("XDG_STATE_HOME")) / "kesto", home / ".local/state/kesto",
+                           fs::path(environment("XDG_CONFIG_HOME")) / "kesto", home / ".config/kesto"},
+                          "/var/lib/kesto", name)
+        / name;
+}
+
+fs::path usualConfigurationDirectory()
+{
+    return usualDirectory(
+        "CONFIGURATION_DIRECTORY",
+        {fs::path(environment("XDG_CONFIG_HOME")) / "kesto", fs::path(environment("HOME")) / ".config/kesto"},
+        "/etc/kesto");
+}
+
+fs::path usualLogsDirectory()
+{
+    const fs::path home = environment("HOME");
+    return usualDirectory("LOGS_DIRECTORY", // the last two are those of service managers before version 254
+                          {fs::path(environment("XDG_STATE_HOME")) / "log/kesto", home / ".local/state/log/kesto",
+                           fs::path(environment("XDG_CONFIG_HOME")) / "log/kesto", home / ".config/log/kesto"},
+                          "/var/log/kesto");
+}
+
+fs::path usualRuntimeDirectory()
+{
+    return usualDirectory("RUNTIME_DIRECTORY", {fs::path(environment("XDG_RUNTIME_DIR")) / "kesto"}, "/run/kesto");
+}
