@@ -13,6 +13,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <utility>
 
 namespace platform {
 
@@ -37,13 +38,16 @@ public:
     // The connection whose call the calling thread is handling, or null.
     [[nodiscard]] static const Connection* current() noexcept { return current_; }
 
-    // Makes a connection the current one of this thread while its call is being handled.
+    // Makes a connection the current one of this thread while its calls are being handled.
     class CallScope {
     public:
-        explicit CallScope(const Connection& connection) noexcept { current_ = &connection; }
-        ~CallScope() { current_ = nullptr; }
+        explicit CallScope(const Connection& connection) noexcept : outer_(std::exchange(current_, &connection)) { }
+        ~CallScope() { current_ = outer_; }
         CallScope(const CallScope&) = delete;
         CallScope& operator=(const CallScope&) = delete;
+
+    private:
+        const Connection* const outer_;
     };
 
     // Who is at the other end, as the kernel told at acceptance. Any thread.

@@ -1,3 +1,4 @@
+// How payloads are laid out behind each other, who pays for them, and what tells a repetition.
 #include "session/KestoReportingMessageStore.h"
 
 #include "foundation/Cbor.h"
@@ -16,8 +17,8 @@ constexpr std::size_t largestChunk = std::size_t{256} << 10;
 // A larger payload accepted last is decoded again when it is compared: it would take many times its bytes.
 constexpr std::size_t largestKeptDecoded = 1024;
 
-// Larger payloads are kept as they are: none comes from a client in one frame, only the summary of a session
-// grows like that, and it need not be in memory twice.
+// Larger payloads are kept as they are: only what a session derives itself grows like that, and it need not be in
+// memory twice.
 constexpr std::size_t largestEncoded = std::size_t{1} << 20;
 
 // Stamps that a client may add to any message; they say when, not what.
@@ -43,30 +44,41 @@ foundation::Dictionary KestoReportingMessageStore::Payload::dictionary() const
 }
 
 KestoReportingMessageStore::KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget)
-    : budget_(std::move(budget))
+    : share_(std::move(budget))
 {
-}
-
-KestoReportingMessageStore::~KestoReportingMessageStore()
-{
-    budget_->giveBack(paid_);
 }
 
 KestoReportingMessageStore::Outcome KestoReportingMessageStore::record(AudioEventCategory category, AudioEventType type,
                                                                        const foundation::Dictionary& payload)
 {
-    const std::uint32_t number = kindOf(category, type);
-    Kind& kind = kinds_[number];
+    const auto number = kindOf(category, type);
+    if (!number)
+        return Outcome::Full;
+    Kind& kind = kinds_[*number];
     const bool isError = category == AudioEventCategoryError || type == AudioEventTypeError;
     if (!isError && repeatsLast(kind, payload))
         return Outcome::Redundant;
-    if (!append(number, payload, kind.last))
+    if (!append(*number, payload, kind.last))
         return Outcome::Full;
     ++size_;
     ++kind.count;
-    kind.isLastDecoded = kind.last.encoded_.size() <= largestKeptDecoded;
+    kind.isLastDecoded = payForDecoded(kind, payload);
     kind.lastDecoded = kind.isLastDecoded ? payload : foundation::Dictionary();
     return Outcome::Recorded;
+}
+
+// What a kind has paid for once, it keeps for its next payloads, which take as much as a rule.
+bool KestoReportingMessageStore::payForDecoded(Kind& kind, const foundation::Dictionary& payload)
+{
+    if (kind.last.kept_ != nullptr || kind.last.encoded_.size() > largestKeptDecoded)
+        return false;
+    const std::size_t bytes = payload.roughBytes();
+    if (bytes <= kind.bytesForDecoded)
+        return true;
+    if (!share_.grow(bytes - kind.bytesForDecoded))
+        return false;
+    kind.bytesForDecoded = bytes;
+    return true;
 }
 
 bool KestoReportingMessageStore::repeatsLast(const Kind& kind, const foundation::Dictionary& payload)
@@ -77,30 +89,36 @@ bool KestoReportingMessageStore::repeatsLast(const Kind& kind, const foundation:
 }
 
 // Messages come in runs of one kind, which is told by its numbers.
-std::uint32_t KestoReportingMessageStore::kindOf(AudioEventCategory category, AudioEventType type)
+std::optional<std::uint32_t> KestoReportingMessageStore::kindOf(AudioEventCategory category, AudioEventType type)
 {
-    if (!recent_ || recent_->category != category || recent_->type != type)
-        recent_ = {category, type, kindNamedLike(category, type)};
-    return recent_->kind;
+    if (recent_ && recent_->category == category && recent_->type == type)
+        return recent_->kind;
+    const auto kind = kindNamedLike(category, type);
+    if (kind)
+        recent_ = {category, type, *kind};
+    return kind;
 }
 
-// Numbers that share their names are one kind.
-std::uint32_t KestoReportingMessageStore::kindNamedLike(AudioEventCategory category, AudioEventType type)
+// Numbers that share their names are one kind. Nothing when there is no memory left for a new one.
+std::optional<std::uint32_t> KestoReportingMessageStore::kindNamedLike(AudioEventCategory category, AudioEventType type)
 {
     std::string key = KestoReportingUtilityCategoryString(category);
     key += '_';
     key += KestoReportingUtilityTypeString(type);
-    const auto [found, isNew] = kindByKey_.try_emplace(std::move(key), static_cast<std::uint32_t>(kinds_.size()));
-    if (isNew)
-        kinds_.emplace_back().key = found->first;
-    return found->second;
+    if (const auto found = kindByKey_.find(key); found != kindByKey_.end())
+        return found->second;
+    if (!share_.grow(bytesOfAKind + key.size()))
+        return std::nullopt;
+    const auto number = static_cast<std::uint32_t>(kinds_.size());
+    kinds_.emplace_back().key = kindByKey_.emplace(std::move(key), number).first->first;
+    return number;
 }
 
 bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Dictionary& payload, Payload& appended)
 {
     const std::size_t size = textSize(payload);
     const bool isLarge = size > largestEncoded;
-    if (isLarge && !pay(size))
+    if (isLarge && !share_.grow(size))
         return false;
     scratch_.clear();
     if (!isLarge)
@@ -109,7 +127,7 @@ bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Di
     char* place = allocate(sizeof head + scratch_.size());
     if (place == nullptr) {
         if (isLarge)
-            refund(size);
+            share_.shrink(size);
         return false;
     }
     std::memcpy(place, &head, sizeof head);
@@ -119,28 +137,13 @@ bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Di
     return true;
 }
 
-// Takes so many bytes from the budget.
-bool KestoReportingMessageStore::pay(std::size_t bytes)
-{
-    if (!budget_->take(bytes))
-        return false;
-    paid_ += bytes;
-    return true;
-}
-
-void KestoReportingMessageStore::refund(std::size_t bytes)
-{
-    budget_->giveBack(bytes);
-    paid_ -= bytes;
-}
-
 // Room for so many bytes, or null pointer when the budget has no more.
 char* KestoReportingMessageStore::allocate(std::size_t bytes)
 {
     if (chunks_.empty() || chunks_.back().capacity - chunks_.back().used < bytes) {
         const std::size_t next = chunks_.empty() ? firstChunk : std::min(chunks_.back().capacity * 2, largestChunk);
         const std::size_t capacity = std::max(next, bytes);
-        if (!pay(capacity))
+        if (!share_.grow(capacity))
             return nullptr;
         chunks_.push_back({std::make_unique_for_overwrite<char[]>(capacity), 0, capacity});
     }
@@ -152,7 +155,7 @@ char* KestoReportingMessageStore::allocate(std::size_t bytes)
 
 std::string KestoReportingMessageStore::identifier(const Message& message) const
 {
-    return kinds_[message.kind].key + '_' + std::to_string(message.index);
+    return std::string(kinds_[message.kind].key) + '_' + std::to_string(message.index);
 }
 
 foundation::Dictionary KestoReportingMessageStore::counts() const

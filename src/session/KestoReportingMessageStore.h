@@ -65,7 +65,7 @@ public:
     };
 
     explicit KestoReportingMessageStore(std::shared_ptr<KestoReportingStorageBudget> budget);
-    ~KestoReportingMessageStore();
+    ~KestoReportingMessageStore() = default;
     KestoReportingMessageStore(const KestoReportingMessageStore&) = delete;
     KestoReportingMessageStore& operator=(const KestoReportingMessageStore&) = delete;
 
@@ -108,12 +108,15 @@ public:
 
 private:
     struct Kind {
-        std::string key;
+        std::string_view key; // in `kindByKey_`
         std::uint64_t count = 0;
         Payload last;
         foundation::Dictionary lastDecoded; // while `isLastDecoded`
         bool isLastDecoded = false;
+        std::size_t bytesForDecoded = 0; // paid for `lastDecoded`
     };
+    // What a kind takes beside its key and its payloads: itself, in a vector that doubles, and its place in the index.
+    static constexpr std::size_t bytesOfAKind = 2 * sizeof(Kind) + 96;
     struct Recent {
         AudioEventCategory category;
         AudioEventType type;
@@ -125,22 +128,20 @@ private:
         std::size_t capacity = 0;
     };
 
-    std::uint32_t kindOf(AudioEventCategory category, AudioEventType type);
-    std::uint32_t kindNamedLike(AudioEventCategory category, AudioEventType type);
+    std::optional<std::uint32_t> kindOf(AudioEventCategory category, AudioEventType type);
+    std::optional<std::uint32_t> kindNamedLike(AudioEventCategory category, AudioEventType type);
     [[nodiscard]] static bool repeatsLast(const Kind& kind, const foundation::Dictionary& payload);
     [[nodiscard]] bool append(std::uint32_t kind, const foundation::Dictionary& payload, Payload& appended);
-    [[nodiscard]] bool pay(std::size_t bytes);
-    void refund(std::size_t bytes);
+    [[nodiscard]] bool payForDecoded(Kind& kind, const foundation::Dictionary& payload);
     [[nodiscard]] char* allocate(std::size_t bytes);
 
-    const std::shared_ptr<KestoReportingStorageBudget> budget_;
+    KestoReportingStorageShare share_;
     std::vector<Chunk> chunks_;
     std::deque<foundation::Dictionary> keptAside_;
     std::vector<Kind> kinds_;
     std::unordered_map<std::string, std::uint32_t> kindByKey_;
-    std::optional<Recent> recent_; // the message before this one
+    std::optional<Recent> recent_; // the kind of the message before this one
     std::size_t size_ = 0;
-    std::size_t paid_ = 0;
     std::string scratch_;
 };
 

@@ -10,11 +10,41 @@
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
+namespace {
+
+// As much of the application's name as a log line needs: the client chooses it, and all sessions stand in one line.
+std::string applicationText(const foundation::Dictionary& configuration)
+{
+    constexpr std::size_t longest = 256;
+    return std::string(
+        foundation::cutBetweenCharacters(KestoReportingUtilityRetrieveAppName(configuration).text(), longest));
+}
+
+// What a snapshot takes, roughly.
+std::size_t roughBytes(const KestoReportingDriverSnapShot& snapShot)
+{
+    std::size_t bytes = 0;
+    for (const auto& [driver, sample] : snapShot)
+        for (const platform::ReportingChannel& channel : sample.channels) {
+            bytes += sizeof channel + channel.buckets.size() * sizeof(platform::HistogramBucket);
+            for (const auto* text : {&channel.driver, &channel.group, &channel.subgroup, &channel.name, &channel.unit})
+                bytes += text->has_value() ? (*text)->size() : 0;
+            for (const platform::StateResidency& state : channel.states)
+                bytes += sizeof state + state.name.size();
+        }
+    return bytes;
+}
+
+} // namespace
+
 KestoReportingSession::KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
                                              std::shared_ptr<KestoReportingStorageBudget> budget)
-    : reporterID_(reporterID),
+    : applicationText_(applicationText({})),
+      reporterID_(reporterID),
       processIdentifiers_(std::move(processIdentifiers)),
-      budget_(std::move(budget))
+      budget_(std::move(budget)),
+      configurationShare_(budget_),
+      driverSnapShotShare_(budget_)
 {
     KESTO_LOG(KestoReportingSessionCategory(), Info, "created reporting session for ID: {}", reporterID_);
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionCreated);
@@ -28,10 +58,11 @@ KestoReportingSession::~KestoReportingSession()
 
 std::string KestoReportingSession::description() const
 {
+    const foundation::Lock lock(configurationLock_);
     return foundation::format("reporterID={},serviceName={},ownerPid={},HostApplicationDisplayID={},started={}",
                               reporterID_, serviceName_.empty() ? "(null)" : serviceName_,
-                              processIdentifiers_.empty() ? 0 : processIdentifiers_.front(),
-                              KestoReportingUtilityRetrieveAppName(configuration()).text(), started_ ? 1 : 0);
+                              processIdentifiers_.empty() ? 0 : processIdentifiers_.front(), applicationText_,
+                              started_ ? 1 : 0);
 }
 
 void KestoReportingSession::setServiceType(AudioServiceType type)
@@ -65,7 +96,26 @@ void KestoReportingSession::updateConfigurationWithContentsOfConfiguration(
                   largestConfiguration);
         return;
     }
+    if (!configurationShare_.resize(merged.roughBytes())) {
+        KESTO_LOG(KestoReportingSessionCategory(), Error,
+                  "no memory left for the configuration of session {}; the change is ignored", reporterID_);
+        return;
+    }
     configuration_ = std::move(merged);
+    if (configuration->contains(KestoReportingHostApplicationKey))
+        applicationText_ = applicationText(configuration_);
+}
+
+void KestoReportingSession::setDriverSnapShot(std::optional<KestoReportingDriverSnapShot> snapShot)
+{
+    if (!driverSnapShotShare_.resize(snapShot ? roughBytes(*snapShot) : 0)) {
+        KESTO_LOG(KestoReportingSessionCategory(), Error,
+                  "no memory left for the drivers' snapshot of session {}; its driver statistics are lost",
+                  reporterID_);
+        snapShot.reset();
+        driverSnapShotShare_.shrink(driverSnapShotShare_.bytes());
+    }
+    driverSnapShot_ = std::move(snapShot);
 }
 
 void KestoReportingSession::start()
@@ -79,7 +129,7 @@ void KestoReportingSession::start()
     messagesLost_ = 0;
     {
         const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        nestedAggregatedPayloadData_ = std::make_unique<KestoReportingMessageStore>(budget_);
+        nestedAggregatedPayloadData_ = std::make_shared<KestoReportingMessageStore>(budget_);
     }
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStarted);
     startTracing();
@@ -106,16 +156,20 @@ void KestoReportingSession::stop()
     started_ = false;
 }
 
+// To be read without its lock, which would keep recorders waiting for a disk: whoever stops the session is the one who
+// records, so nothing is recorded meanwhile.
+std::shared_ptr<const KestoReportingMessageStore> KestoReportingSession::store() const
+{
+    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+    return nestedAggregatedPayloadData_;
+}
+
 void KestoReportingSession::sendVolumeEvents()
 {
     const auto application = KestoReportingUtilityRetrieveAppName(configuration());
     const auto process = application.isNull() ? std::nullopt : std::optional(application);
     const double minimumPlaytime = KestoReportingUtilityVolumeMinimumPlayingTime(serviceType_);
-    std::vector<foundation::Dictionary> volumeEvents;
-    {
-        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        volumeEvents = createVolumeMessages(*nestedAggregatedPayloadData_, process, minimumPlaytime);
-    }
+    const auto volumeEvents = createVolumeMessages(*store(), process, minimumPlaytime);
     if (volumeEvents.empty())
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Default, "sending volume event for reporter {}", reporterID_);

@@ -1,8 +1,8 @@
 // One reporting session of one client process: identity, service type, configuration, and, between start and
 // stop, the messages that were sent to it.
 //
-// A session records and says nothing to anybody: handing messages to the sinks is its client instance's work,
-// which calls the session and the sinks side by side.
+// A session records what it is sent; handing that to the sinks is its client instance's work, which calls the session
+// and the sinks side by side. Only the volume events, which it derives itself, it hands to the analytics bridge.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -28,13 +28,13 @@ class TraceRunner;
 // sends never is this object.
 extern const foundation::String KestoReportingTraceTypeKtrace;
 
-// Owned by a shared pointer. Driven from the server queue. What sinks read (service type, configuration) may be read
-// from any thread.
+// Owned by a shared pointer. Driven from the server queue, on which all that its client instance keeps in it is read
+// and written. What sinks read (service type, configuration) may be read from any thread, and so may what it recorded.
 class KestoReportingSession final : public KestoReportingSinkSession,
                                     public std::enable_shared_from_this<KestoReportingSession> {
 public:
-    // The identity never changes. The first process is the session's owner. Recorded messages are paid from
-    // the budget.
+    // The identity never changes. The first process is the session's owner. What the session keeps for its client is
+    // paid from the budget.
     KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
                           std::shared_ptr<KestoReportingStorageBudget> budget = KestoReportingStorageBudget::service());
     ~KestoReportingSession() override;
@@ -53,7 +53,7 @@ public:
 
     [[nodiscard]] foundation::Dictionary configuration() const override;
     // Adds all entries, replacing those of the same key; no dictionary changes nothing. A configuration that would
-    // outgrow `largestConfiguration` bytes stays as it was, with a log line.
+    // outgrow `largestConfiguration` bytes, or the budget, stays as it was, with a log line.
     void setConfiguration(const std::optional<foundation::Dictionary>& configuration);
     void updateConfigurationWithContentsOfConfiguration(const std::optional<foundation::Dictionary>& configuration);
     static constexpr std::size_t largestConfiguration = std::size_t{1} << 20;
@@ -92,18 +92,21 @@ public:
                                   AudioEventType type, AudioServiceType serviceType,
                                   const foundation::Dictionary& userInfo, const KestoReportingReply& reply);
 
-    // The payloads of the messages in order, those that carry any of the keys folded together: one that comes no
+    // What the volume analysis does with bursts, of whole payloads and for any keys: the payloads of the messages in
+    // order, those that carry any of the keys folded together: one that comes no
     // more than the pause (seconds) after the one before joins it, at the place of the first of them.
     [[nodiscard]] static std::vector<foundation::Dictionary>
     combineRapidMessages(const KestoReportingMessageStore& messages, std::span<const std::string_view> keysToCombine,
                          double maximumPausetime);
     // One event for each stretch of more than so many seconds during which output ran unchanged. Without a process
-    // there are none.
+    // there are none. Events that would take more than `mostVolumeEventBytes` together are lost, with a log line.
     [[nodiscard]] static std::vector<foundation::Dictionary>
     createVolumeMessages(const KestoReportingMessageStore& messages, const std::optional<foundation::Value>& process,
                          double minimumPlaytime);
+    static constexpr std::size_t mostVolumeEventBytes = std::size_t{64} << 20;
 
-    // For every key of this run's messages all values that it took, joined by commas; nothing without messages.
+    // For every key of this run's messages all values that it took, joined by commas; nothing without messages. One
+    // that the budget has no room for is lost like a message, with a log line. Nothing is recorded meanwhile.
     [[nodiscard]] std::optional<foundation::Dictionary> createSummaryEventForSession() const;
     // On internal builds writes this run's messages to a file below the diagnostic-log root. What fails is logged.
     void writeSummaryJson() const;
@@ -118,12 +121,10 @@ public:
         transactionCompleteBlock_ = std::move(block);
     }
 
-    // What the drivers' channels held when the session started; set and cleared by the client instance.
+    // What the drivers' channels held when the session started; set and cleared by the client instance. One that the
+    // budget has no room for is not kept, with a log line.
     [[nodiscard]] const std::optional<KestoReportingDriverSnapShot>& driverSnapShot() const { return driverSnapShot_; }
-    void setDriverSnapShot(std::optional<KestoReportingDriverSnapShot> snapShot)
-    {
-        driverSnapShot_ = std::move(snapShot);
-    }
+    void setDriverSnapShot(std::optional<KestoReportingDriverSnapShot> snapShot);
 
     // Asked for by the client; kept for it and never read here.
     [[nodiscard]] bool blinReportingEnabled() const { return blinReportingEnabled_; }
@@ -140,6 +141,7 @@ public:
     [[nodiscard]] static bool shouldReportOrientation() { return false; }
 
 private:
+    [[nodiscard]] std::shared_ptr<const KestoReportingMessageStore> store() const;
     [[nodiscard]] std::string summaryFileName() const;
     void sendVolumeEvents();
     void sendSummaryEvent();
@@ -151,19 +153,22 @@ private:
     bool startedTracing_ = false;
     std::atomic<AudioServiceType> serviceType_{0};
     foundation::Dictionary configuration_ KESTO_GUARDED_BY(configurationLock_);
+    std::string applicationText_ KESTO_GUARDED_BY(configurationLock_); // the host application's name, for the log
     std::optional<KestoReportingDriverSnapShot> driverSnapShot_;
     KestoReportingResultReply<bool> transactionCompleteBlock_;
     const std::int64_t reporterID_;
     const std::vector<std::int32_t> processIdentifiers_;
-    std::unique_ptr<KestoReportingMessageStore>
+    std::shared_ptr<KestoReportingMessageStore>
         nestedAggregatedPayloadData_ KESTO_GUARDED_BY(nestedAggregatedPayloadDataLock_);
     std::string_view serviceName_;
     std::optional<std::string> tracingFileName_;
     std::unique_ptr<TraceParams> traceParams_;
     std::unique_ptr<TraceRunner> traceRunner_;
 
-    std::shared_ptr<KestoReportingStorageBudget> budget_;
-    std::uint64_t messagesLost_ = 0; // in this run, for want of memory
+    const std::shared_ptr<KestoReportingStorageBudget> budget_;
+    KestoReportingStorageShare configurationShare_ KESTO_GUARDED_BY(configurationLock_);
+    KestoReportingStorageShare driverSnapShotShare_;
+    mutable std::uint64_t messagesLost_ = 0; // in this run, for want of memory
     mutable foundation::Mutex configurationLock_;
     mutable foundation::Mutex nestedAggregatedPayloadDataLock_;
 };

@@ -9,8 +9,9 @@
 #include "session/KestoReportingSession.h"
 #include "utility/KestoReportingUtility.h"
 
+#include <algorithm>
 #include <filesystem>
-#include <unordered_map>
+#include <map>
 
 namespace {
 
@@ -21,12 +22,20 @@ constexpr std::string_view summaryDirectory = "Audio/Reporting";
 constexpr unsigned summaryDirectoryPermissions = 0777;
 
 // The texts of each key's values, joined by commas, in the order in which the keys first came.
+//
+// Clients choose how many keys there are and how long the texts become, and a text may be many times what its values
+// take in the store: what is gathered is paid from the budget while it is.
 class ValuesByKey {
 public:
+    explicit ValuesByKey(std::shared_ptr<KestoReportingStorageBudget> budget) : share_(std::move(budget)) { }
+
     template <typename Item> void append(std::string_view key, const Item& value)
     {
+        if (isOutOfMemory_)
+            return;
         const bool isFirst = !moveTo(key);
         foundation::StringBuilder& text = values_[position_].text;
+        const std::size_t sizeBefore = text.size();
         if (!isFirst)
             text.append(',');
         if (const auto number = value.number())
@@ -35,10 +44,14 @@ public:
             text.append(value.stringView());
         else
             text.append(value.text());
+        pay((isFirst ? bytesOfAKey + key.size() : 0) + text.size() - sizeBefore);
     }
 
-    Dictionary finish() &&
+    // Nothing when the budget had too little memory.
+    std::optional<Dictionary> finish() &&
     {
+        if (isOutOfMemory_)
+            return std::nullopt;
         Dictionary::Entries entries;
         for (auto& [key, text] : values_)
             entries.push_back({key, std::move(text).finish()});
@@ -50,38 +63,46 @@ private:
         foundation::String key;
         foundation::StringBuilder text;
     };
+    static constexpr std::size_t bytesOfAKey = 256; // in all that knows it, here and in the dictionary
+    static constexpr std::size_t paidAtOnce = 4096;
 
     // False when the key is new. Keys come in the same order in nearly every message: the next one is tried first.
+    // A sorted index otherwise: no choice of keys makes it slow.
     bool moveTo(std::string_view key)
     {
         ++position_;
         if (position_ < values_.size() && values_[position_].key == key)
             return true;
-        const auto [found, isNew] = positions_.try_emplace(std::string(key), values_.size());
-        if (isNew)
-            values_.push_back({key, {}});
-        position_ = found->second;
-        return !isNew;
+        const auto found = positions_.find(key);
+        position_ = found == positions_.end() ? values_.size() : found->second;
+        if (found != positions_.end())
+            return true;
+        values_.push_back({key, {}});
+        positions_.emplace(values_.back().key, position_);
+        return false;
+    }
+
+    void pay(std::size_t bytes)
+    {
+        used_ += bytes;
+        if (used_ > share_.bytes())
+            isOutOfMemory_ = !share_.grow(std::max(used_ - share_.bytes(), paidAtOnce));
     }
 
     std::vector<Values> values_;
-    std::unordered_map<std::string, std::size_t> positions_;
+    std::map<std::string_view, std::size_t>
+        positions_; // the keys are those of `values_`, whose characters stay in place
     std::size_t position_ = 0;
+    KestoReportingStorageShare share_;
+    std::size_t used_ = 0;
+    bool isOutOfMemory_ = false;
 };
 
 // What a client chose, made fit to be part of a file name: it cannot leave the directory, and whole characters of it
 // take no more bytes than there is room for.
 std::string fileNamePart(std::string_view text, std::size_t room)
 {
-    const auto isInsideCharacter = [text](std::size_t at) {
-        return (static_cast<unsigned char>(text[at]) & 0xC0) == 0x80;
-    };
-    if (room < text.size()) {
-        while (room > 0 && isInsideCharacter(room))
-            --room;
-        text = text.substr(0, room);
-    }
-    std::string part(text);
+    std::string part(foundation::cutBetweenCharacters(text, room));
     for (char& character : part)
         if (character == '/' || character == '\0')
             character = '_';
@@ -115,19 +136,24 @@ std::optional<Dictionary> KestoReportingSession::createSummaryEventForSession() 
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
     if (!nestedAggregatedPayloadData_ || nestedAggregatedPayloadData_->empty())
         return std::nullopt;
-    ValuesByKey values;
+    ValuesByKey values(budget_);
     values.append(summaryKey, foundation::Value(serviceType_.load()));
     nestedAggregatedPayloadData_->forEach([&](const KestoReportingMessageStore::Message& message) {
         message.payload.forEach([&](std::string_view key, const auto& value) { values.append(key, value); });
     });
-    return std::move(values).finish();
+    auto summary = std::move(values).finish();
+    if (!summary) {
+        ++messagesLost_;
+        KESTO_LOG(KestoReportingSessionCategory(), Error, "no memory left for the summary of session {}; it is lost",
+                  reporterID_);
+    }
+    return summary;
 }
 
 void KestoReportingSession::writeSummaryJson() const
 {
-    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    if (!KestoReportingUtilityIsInternalBuild() || !nestedAggregatedPayloadData_
-        || nestedAggregatedPayloadData_->empty())
+    const auto store = this->store();
+    if (!KestoReportingUtilityIsInternalBuild() || !store || store->empty())
         return;
     platform::FileSystem& files = platform::current().fileSystem;
     const std::filesystem::path directory = files.diagnosticLogRoot() / summaryDirectory;
@@ -135,7 +161,7 @@ void KestoReportingSession::writeSummaryJson() const
     const std::filesystem::path path = directory / summaryFileName();
     const auto file = files.createAtomically(path);
 
-    const bool isSerialised = writeJson(*nestedAggregatedPayloadData_, [&](std::string_view text) {
+    const bool isSerialised = writeJson(*store, [&](std::string_view text) {
         if (file)
             (*file)->write(text);
     });

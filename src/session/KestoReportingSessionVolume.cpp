@@ -9,6 +9,7 @@
 #include "utility/KestoReportingUtility.h"
 
 #include <algorithm>
+#include <array>
 
 namespace {
 
@@ -19,6 +20,11 @@ using Key = KestoReportingVolumeKey;
 
 constexpr std::string_view functionName = "+[KestoReportingSession createVolumeMessages:process:minimumPlaytime:]";
 constexpr double longestPause = 2.0; // seconds, within a burst
+
+// What of the state an event tells.
+constexpr std::array keysOfAnEvent{
+    Key::SelectedFormat,        Key::ActiveDevices, Key::Volume,          Key::SpatialAudioAccessoryFeature,
+    Key::SpatializationEnabled, Key::RingerState,   Key::ChannelsPerFrame};
 
 // What folding bursts needs to know of the payloads as the analysis sees them.
 struct VolumePayloads {
@@ -72,7 +78,7 @@ public:
     void process(const Fields& payload)
     {
         const double time = payload.number(Key::Timestamp).doubleValue();
-        const bool wasRunning = state_.boolean(Key::OutputRunning);
+        const bool wasRunning = stateIsRunning_;
         bool isChanged = payload.has(Key::Duration);
         if (payload.has(Key::OutputRunning)) {
             isRunning_ = payload.boolean(Key::OutputRunning);
@@ -88,7 +94,7 @@ public:
         }
         if (!isRunning_)
             segmentStart_.reset();
-        state_.merge(payload);
+        merge(payload);
     }
 
     // The events, each with their number.
@@ -101,6 +107,10 @@ public:
             event.push_back({countKey, events_.size()});
             events.emplace_back(std::move(event));
         }
+        if (eventsLost_ != 0)
+            KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Error,
+                      "{} volume events are lost: with them there would be more than {} bytes", eventsLost_,
+                      KestoReportingSession::mostVolumeEventBytes);
         return events;
     }
 
@@ -129,6 +139,25 @@ private:
             && payload.value(Key::Volume) != state_.value(Key::Volume);
     }
 
+    void merge(const Fields& payload)
+    {
+        for (std::size_t index = 0; index < stateValues_.size(); ++index)
+            if (const auto key = static_cast<Key>(index); payload.has(key) && !payload.isSameEncoding(state_, key))
+                stateValues_[index].reset();
+        if (payload.has(Key::OutputRunning))
+            stateIsRunning_ = payload.boolean(Key::OutputRunning);
+        state_.merge(payload);
+    }
+
+    // Unpacked once, and shared by all events until it changes: a client may say once what a million events repeat.
+    const Value& stateValue(Key key)
+    {
+        auto& value = stateValues_[static_cast<std::size_t>(key)];
+        if (!value)
+            value = state_.value(key);
+        return *value;
+    }
+
     void endSegment(double playTime)
     {
         if (!(playTime > minimumPlaytime_) || !process_ || !state_.has(Key::Volume)) {
@@ -137,42 +166,62 @@ private:
                       events_.size());
             return;
         }
+        if (!hasRoomForEvent()) {
+            ++eventsLost_;
+            return;
+        }
         events_.push_back(makeEvent(playTime));
         KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Debug,
                   "added volume message {{ func={}, action=add, count={} }}", functionName, events_.size());
     }
 
-    [[nodiscard]] Dictionary::Entries makeEvent(double playTime) const
+    // Each is written several times, text that it shares with others too: what all take together has a bound.
+    bool hasRoomForEvent()
+    {
+        constexpr std::size_t bytesOfAnEvent = 256; // beside what a client says
+        std::size_t bytes = bytesOfAnEvent + process_->roughBytes();
+        for (const Key key : keysOfAnEvent)
+            bytes += stateValue(key).roughBytes();
+        if (bytes > KestoReportingSession::mostVolumeEventBytes - bytesOfEvents_)
+            return false;
+        bytesOfEvents_ += bytes;
+        return true;
+    }
+
+    [[nodiscard]] Dictionary::Entries makeEvent(double playTime)
     {
         const auto bucketed = [](double number, std::span<const double> buckets, unsigned places) {
-            return Value(KestoReportingUtilityBucketNumberToString(number, buckets, places).value_or(""));
+            return Value(*KestoReportingUtilityBucketNumberToString(number, buckets, places));
         };
         const auto fromState = [this](Key key) {
-            return Dictionary::Entry{KestoReportingVolumeKeyName(key), state_.value(key)};
+            return Dictionary::Entry{KestoReportingVolumeKeyName(key), stateValue(key)};
         };
-        return {
-            fromState(Key::SelectedFormat),
-            fromState(Key::ActiveDevices),
-            {KestoReportingHostApplicationKey, *process_},
-            fromState(Key::Volume),
-            {"PomoSessionVolumeBucketed",
-             bucketed(state_.number(Key::Volume).doubleValue(), KestoReportingUtilityBucketNumberToStringVolumes, 4)},
-            {"play_seconds", static_cast<float>(playTime)},
-            fromState(Key::SpatialAudioAccessoryFeature),
-            fromState(Key::SpatializationEnabled),
-            fromState(Key::RingerState),
-            fromState(Key::ChannelsPerFrame),
-            {"play_secondsBucketed", bucketed(playTime, KestoReportingUtilityBucketNumberToStringTimes, 0)},
-            {"msgidx", events_.size() + 1}};
+        return {fromState(Key::SelectedFormat),
+                fromState(Key::ActiveDevices),
+                {KestoReportingHostApplicationKey, *process_},
+                fromState(Key::Volume),
+                {"PomoSessionVolumeBucketed",
+                 bucketed(stateValue(Key::Volume).asDouble(), KestoReportingUtilityBucketNumberToStringVolumes, 4)},
+                {"play_seconds", static_cast<float>(playTime)},
+                fromState(Key::SpatialAudioAccessoryFeature),
+                fromState(Key::SpatializationEnabled),
+                fromState(Key::RingerState),
+                fromState(Key::ChannelsPerFrame),
+                {"play_secondsBucketed", bucketed(playTime, KestoReportingUtilityBucketNumberToStringTimes, 0)},
+                {"msgidx", events_.size() + 1}};
     }
 
     const std::optional<Value>& process_;
     const double minimumPlaytime_;
     KestoReportingVolumeFieldsReader constants_;
     Fields state_;
+    std::array<std::optional<Value>, static_cast<std::size_t>(Key::Count)> stateValues_; // those that were asked for
+    bool stateIsRunning_ = false;
     bool isRunning_ = false;
     std::optional<double> segmentStart_;
     std::vector<Dictionary::Entries> events_;
+    std::size_t bytesOfEvents_ = 0;
+    std::uint64_t eventsLost_ = 0;
 };
 
 } // namespace

@@ -1,3 +1,4 @@
+// A budget is a number that never exceeds its limit, and neither does that of the budget around it.
 #include "session/KestoReportingStorageBudget.h"
 
 const std::shared_ptr<KestoReportingStorageBudget>& KestoReportingStorageBudget::service()
@@ -24,4 +25,26 @@ void KestoReportingStorageBudget::giveBack(std::size_t bytes)
     taken_.fetch_sub(bytes, std::memory_order_relaxed);
     if (enclosing_)
         enclosing_->giveBack(bytes);
+}
+
+bool KestoReportingStorageShare::grow(std::size_t bytes)
+{
+    if (!budget_->take(bytes))
+        return false;
+    bytes_ += bytes;
+    return true;
+}
+
+bool KestoReportingStorageShare::resize(std::size_t bytes)
+{
+    if (bytes > bytes_)
+        return grow(bytes - bytes_);
+    shrink(bytes_ - bytes);
+    return true;
+}
+
+void KestoReportingStorageShare::shrink(std::size_t bytes)
+{
+    budget_->giveBack(bytes);
+    bytes_ -= bytes;
 }

@@ -1,5 +1,7 @@
-// How much memory recorded messages may take: one budget for the service, and within it one a client, so
-// that no client, and not all of them together, can fill the device's memory.
+// How much memory may be taken by what clients have the service keep: one budget for the service, and within it one a
+// client, so that no client, and not all of them together, can fill the device's memory.
+//
+// Whoever keeps something for a client holds a share of its budget that grows and shrinks with it.
 #pragma once
 
 #include <atomic>
@@ -33,4 +35,26 @@ private:
     const std::size_t limit_;
     const std::shared_ptr<KestoReportingStorageBudget> enclosing_;
     std::atomic<std::size_t> taken_{0};
+};
+
+// What is paid for one thing that is kept; it goes back to the budget when the share goes. One thread at a time.
+class KestoReportingStorageShare {
+public:
+    explicit KestoReportingStorageShare(std::shared_ptr<KestoReportingStorageBudget> budget)
+        : budget_(std::move(budget))
+    {
+    }
+    ~KestoReportingStorageShare() { budget_->giveBack(bytes_); }
+    KestoReportingStorageShare(const KestoReportingStorageShare&) = delete;
+    KestoReportingStorageShare& operator=(const KestoReportingStorageShare&) = delete;
+
+    [[nodiscard]] std::size_t bytes() const { return bytes_; }
+    // Pays for so many bytes more, or for so many in all; false, and nothing changed, when the budget has no more.
+    [[nodiscard]] bool grow(std::size_t bytes);
+    [[nodiscard]] bool resize(std::size_t bytes);
+    void shrink(std::size_t bytes);
+
+private:
+    const std::shared_ptr<KestoReportingStorageBudget> budget_;
+    std::size_t bytes_ = 0;
 };

@@ -1,3 +1,4 @@
+// Finding the fields among the entries of a message.
 #include "session/KestoReportingVolumeFields.h"
 
 #include "foundation/Cbor.h"
@@ -19,7 +20,7 @@ constexpr std::array<std::string_view, static_cast<std::size_t>(Key::Count)> nam
                                                                                    "mChannelsPerFrame"};
 
 // By length first: nearly every key of a message is told apart by it.
-std::optional<Key> keyOf(std::string_view name)
+constexpr std::optional<Key> keyOf(std::string_view name)
 {
     const auto candidates = [&]() -> std::array<Key, 2> {
         switch (name.size()) {
@@ -36,10 +37,20 @@ std::optional<Key> keyOf(std::string_view name)
         }
     }();
     for (const Key key : candidates)
-        if (key != Key::Count && KestoReportingVolumeKeyName(key) == name)
+        if (key != Key::Count && names[static_cast<std::size_t>(key)] == name)
             return key;
     return std::nullopt;
 }
+
+// No name is forgotten in one of the two places.
+constexpr bool findsEveryKey()
+{
+    for (std::size_t key = 0; key < names.size(); ++key)
+        if (keyOf(names[key]) != static_cast<Key>(key))
+            return false;
+    return true;
+}
+static_assert(findsEveryKey());
 
 } // namespace
 

@@ -303,10 +303,10 @@ TEST_F(SessionMessagesTest, AreHandledTheSameSynchronouslyOrNot)
 TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
 {
     support::TestPlatform platform;
-    const auto budget = std::make_shared<KestoReportingStorageBudget>(512);
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(1024);
     KestoReportingSession session(42, {7}, budget);
     session.start();
-    const std::string large(400, 'x');
+    const std::string large(600, 'x');
     session.sendMessage(Dictionary{{"a", large}}, playback, start, nullptr);
     platform.log.clear();
     for (const int value : {1, 2, 3})

@@ -241,7 +241,8 @@ TEST_F(SessionStop, HandsVolumeEventsToTheBridgeEvenWhenThereIsNoMemoryToRecordT
     platform.log.clear();
     session->stop();
     EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Volume.Summary"), SizeIs(2));
-    EXPECT_THAT(platform.log.lines(), Contains(IsLine(Default, "kerr", "sending summary event for reporter 42")));
+    EXPECT_THAT(platform.log.lines(),
+                Contains(IsLine(Error, "kerr", "no memory left for the summary of session 42; it is lost")));
     EXPECT_EQ(budget->taken(), 0U);
 }
 

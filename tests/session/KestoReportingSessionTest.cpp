@@ -136,6 +136,19 @@ TEST_F(SessionTest, DescribesWhatItDoesNotKnow)
               "reporterID=-1,serviceName=(null),ownerPid=0,HostApplicationDisplayID=Unknown,started=0");
 }
 
+TEST_F(SessionTest, DescribesNoMoreOfAnApplicationThanALogLineNeeds)
+{
+    session->setConfiguration(Dictionary{{"HostApplicationDisplayID", std::string(255, 'x') + "\u00e9\u00e9"}});
+    EXPECT_EQ(session->description(),
+              "reporterID=42,serviceName=(null),ownerPid=7,HostApplicationDisplayID=" + std::string(255, 'x')
+                  + ",started=0")
+        << "and no half of a character";
+    session->setConfiguration(Dictionary{{"other", 1}});
+    EXPECT_THAT(session->description(), testing::HasSubstr(std::string(255, 'x')));
+    session->setConfiguration(Dictionary{{"HostApplicationDisplayID", foundation::Array{1, 2}}});
+    EXPECT_THAT(session->description(), testing::HasSubstr("HostApplicationDisplayID=[1,2],"));
+}
+
 // --- service type
 
 TEST_F(SessionTest, TakesANameFromItsServiceTypeAndSaysSo)
@@ -224,6 +237,62 @@ TEST_F(SessionTest, LetsNoConfigurationOutgrowItsLimit)
                            "configuration of session 42 would take more than 1048576 bytes; the change is ignored")));
     session->setConfiguration(Dictionary{{"a", 1}});
     EXPECT_EQ(session->configuration(), (Dictionary{{"a", 1}}));
+}
+
+TEST_F(SessionTest, PaysForItsConfiguration)
+{
+    const Dictionary configuration{{"a", std::string(1000, 'x')}};
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(3 * configuration.roughBytes() / 2);
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
+    auto other = std::make_shared<KestoReportingSession>(43, std::vector<std::int32_t>{7}, budget);
+    session->setConfiguration(configuration);
+    EXPECT_EQ(budget->taken(), configuration.roughBytes());
+    session->setConfiguration(configuration);
+    EXPECT_EQ(budget->taken(), configuration.roughBytes()) << "for what it holds, not for what it was told";
+
+    forget();
+    other->setConfiguration(configuration);
+    EXPECT_EQ(other->configuration(), Dictionary());
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Error, "kerr",
+                                   "no memory left for the configuration of session 43; the change is ignored")));
+    session->setConfiguration(Dictionary{{"a", 1}});
+    other->setConfiguration(configuration);
+    EXPECT_EQ(other->configuration(), configuration) << "there is room again";
+    session.reset();
+    other.reset();
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
+TEST_F(SessionTest, HoldsThousandsOfValuesOfOneByteOnlyForWhatTheyTake)
+{
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 20);
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
+    const foundation::Array bytes(std::vector<Value>(100'000, Value(1)));
+    session->setConfiguration(Dictionary{{"a", bytes}}); // 100 KB on the wire
+    EXPECT_EQ(session->configuration(), Dictionary());
+}
+
+TEST_F(SessionTest, PaysForTheDriversSnapshot)
+{
+    platform::ReportingSample sample;
+    sample.channels.resize(10);
+    for (auto& channel : sample.channels)
+        channel.states.resize(10);
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(10'000);
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
+    session->setDriverSnapShot(KestoReportingDriverSnapShot{{"Rx-(null)", sample}});
+    EXPECT_GT(budget->taken(), 10 * sizeof(platform::ReportingChannel) + 100 * sizeof(platform::StateResidency) - 1);
+    EXPECT_THAT(*session->driverSnapShot(), SizeIs(1));
+
+    forget();
+    session->setDriverSnapShot(KestoReportingDriverSnapShot{{"Rx-(null)", sample}, {"Tx-(null)", sample}});
+    EXPECT_EQ(session->driverSnapShot(), std::nullopt);
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Error, "kerr",
+                                   "no memory left for the drivers' snapshot of session 42; its driver statistics are "
+                                   "lost")));
+    EXPECT_EQ(budget->taken(), 0U);
 }
 
 // --- the trace type that only in-process code can hand in
@@ -355,16 +424,16 @@ TEST_P(UntracedSessionTest, TracesNothing)
     EXPECT_THAT(platform.kernelTrace.sessions(), IsEmpty());
 }
 
-constexpr AudioServiceType serviceTypeTest = 11;
 const Dictionary wholeConfiguration{{"KestoReportingPellorinPlistFilePath", "/traces.plist"}};
 
 INSTANTIATE_TEST_SUITE_P(
     WithoutOneOfTheConditions, UntracedSessionTest,
-    testing::Values(std::tuple(serviceTypeTest, false, wholeConfiguration), // the flag is off
+    testing::Values(std::tuple(AudioServiceTypeTest, false, wholeConfiguration), // the flag is off
                     std::tuple(AudioServiceType{0}, true, wholeConfiguration), // another service type
                     std::tuple(AudioServiceType{12}, true, wholeConfiguration),
-                    std::tuple(serviceTypeTest, true, wholeConfiguration.with("KestoReportingTraceType", "ktrace")),
-                    std::tuple(serviceTypeTest, true, wholeConfiguration.with("KestoReportingTraceType", 1)),
-                    std::tuple(serviceTypeTest, true, Dictionary{}))); // no file
+                    std::tuple(AudioServiceTypeTest, true,
+                               wholeConfiguration.with("KestoReportingTraceType", "ktrace")),
+                    std::tuple(AudioServiceTypeTest, true, wholeConfiguration.with("KestoReportingTraceType", 1)),
+                    std::tuple(AudioServiceTypeTest, true, Dictionary{}))); // no file
 
 } // namespace

@@ -56,6 +56,25 @@ TEST(StorageBudget, LeavesRoomForASecondClientWhenOneIsFull)
     EXPECT_GE(KestoReportingStorageBudget::serviceLimit, 2 * KestoReportingStorageBudget::clientLimit);
 }
 
+TEST(StorageShare, GrowsAndShrinksWithWhatItPaysForAndGivesAllBackInTheEnd)
+{
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(100);
+    {
+        KestoReportingStorageShare share(budget);
+        EXPECT_TRUE(share.grow(60));
+        EXPECT_FALSE(share.grow(41));
+        EXPECT_EQ(share.bytes(), 60U);
+        EXPECT_TRUE(share.resize(90));
+        EXPECT_FALSE(share.resize(101));
+        EXPECT_EQ(budget->taken(), 90U) << "what is refused changes nothing";
+        EXPECT_TRUE(share.resize(20));
+        share.shrink(5);
+        EXPECT_EQ(share.bytes(), 15U);
+        EXPECT_EQ(budget->taken(), 15U);
+    }
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
 RC_GTEST_PROP(StorageBudget, IsTheSumOfWhatIsHeldAndNeverAboveItsLimit, ())
 {
     constexpr std::size_t limit = 1000;

@@ -379,6 +379,19 @@ TEST_F(SummaryFile, IsMissedWithOneLineWhenItCannotBeBegun)
                             IsLine(Error, "kerr", "jsonOutput writeToURL: Read-only file system")));
 }
 
+TEST_F(SummaryFile, NamesTheLastOfTwoErrors)
+{
+    platform.fileSystem.directoryError = std::make_error_code(std::errc::permission_denied);
+    platform.fileSystem.createError = std::make_error_code(std::errc::no_such_file_or_directory);
+    record({{"a", 1}});
+    write();
+    EXPECT_THAT(platform.fileSystem.files, IsEmpty());
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Error, "kerr",
+                                   "can't create logging directory at /diagnostics/Audio/Reporting: Permission denied"),
+                            IsLine(Error, "kerr", "jsonOutput writeToURL: No such file or directory")));
+}
+
 TEST_F(SummaryFile, DoesNotKeepASessionFromStopping)
 {
     platform.fileSystem.directoryError = std::make_error_code(std::errc::permission_denied);

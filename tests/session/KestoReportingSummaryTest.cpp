@@ -4,8 +4,10 @@
 #include "session/NaiveAggregation.h"
 #include "support/TestPlatform.h"
 
+#include <algorithm>
 #include <gmock/gmock.h>
 #include <rapidcheck/gtest.h>
+#include <thread>
 
 namespace {
 
@@ -160,6 +162,76 @@ TEST(SummaryOnCustomerBuilds, IsMadeAndRecordedWithoutTimeStamps)
                                      R"("audiotag":"UndefinedUnknown"}})"));
     EXPECT_TRUE(platform.fileSystem.files.empty());
     platform.traceMarkers.setObserver(nullptr);
+}
+
+// --- and what it costs
+
+// A byte of the store may be six characters of the summary.
+TEST(SummaryOfManyValues, IsLostWhenTheBudgetHasNoRoomForIt)
+{
+    support::TestPlatform platform;
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(std::size_t{64} << 10);
+    const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{}, budget);
+    session->start();
+    const foundation::Array manyTruths(std::vector<Value>(10'000, Value(false)));
+    for (int message = 0; message < 2; ++message)
+        session->sendMessage(Dictionary{{"a", manyTruths}}, playback, AudioEventTypeError, nullptr);
+    EXPECT_THAT(*session->nestedAggregatedPayloadData(), SizeIs(2));
+    const std::size_t taken = budget->taken();
+    EXPECT_EQ(session->createSummaryEventForSession(), std::nullopt);
+    EXPECT_EQ(budget->taken(), taken) << "what was gathered is paid back";
+
+    platform.log.clear();
+    session->stop();
+    using support::IsLine;
+    using enum platform::LogLevel;
+    EXPECT_THAT(platform.log.lines(),
+                testing::Contains(IsLine(Error, "kerr", "no memory left for the summary of session 42; it is lost")));
+    EXPECT_THAT(platform.log.lines(),
+                testing::Contains(IsLine(Error, "kerr", "session 42 lost 2 messages for want of memory")));
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
+TEST(SummaryOfManyKeys, PaysForEachOfThem)
+{
+    support::TestPlatform platform;
+    Dictionary::Entries entries;
+    for (int key = 0; key < 20'000; ++key)
+        entries.push_back({foundation::String(std::to_string(key)), 1});
+    const Dictionary message(std::move(entries)); // 160 KB in the store
+    const auto summaryWithin = [&](std::size_t limit) {
+        const auto session = std::make_shared<KestoReportingSession>(
+            42, std::vector<std::int32_t>{}, std::make_shared<KestoReportingStorageBudget>(limit));
+        session->start();
+        session->sendMessage(message, playback, 1, nullptr);
+        EXPECT_THAT(*session->nestedAggregatedPayloadData(), SizeIs(1));
+        return session->createSummaryEventForSession();
+    };
+    EXPECT_EQ(summaryWithin(std::size_t{1} << 20), std::nullopt);
+    const auto summary = summaryWithin(std::size_t{16} << 20);
+    ASSERT_TRUE(summary);
+    EXPECT_EQ(summary->size(), 20'002U) << "with the tag and the service type";
+}
+
+TEST(SummaryAndRecorder, KeepOutOfEachOthersWay)
+{
+    support::TestPlatform platform;
+    const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{});
+    session->start();
+    std::jthread recorder([&] {
+        for (int message = 0; message < 10'000; ++message)
+            session->createMessageIdentifier(playback, 1, Dictionary{{"a", message}});
+    });
+    std::size_t commas = 0;
+    for (int round = 0; round < 100; ++round)
+        if (const auto summary = session->createSummaryEventForSession()) {
+            const std::string text = summary->find("a")->text();
+            const auto now = static_cast<std::size_t>(std::ranges::count(text, ','));
+            EXPECT_GE(now, commas) << "never less than before";
+            commas = now;
+        }
+    recorder.join();
+    EXPECT_EQ(session->messageIdentifierCounts(), (Dictionary{{"Playback_Start", 10'000}}));
 }
 
 // --- against the definition

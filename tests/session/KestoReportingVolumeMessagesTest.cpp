@@ -498,4 +498,46 @@ TEST_F(VolumeMessages, ComeFromABurstOfHundredsOfThousandsOfMessages)
     EXPECT_THAT(playTimes(payloads), ElementsAre("1000"));
 }
 
+// --- and what they cost
+
+TEST_F(VolumeMessages, ShareWhatAClientSaidOnce)
+{
+    const std::string large(std::size_t{1} << 20, 'x');
+    Messages payloads{startAt(0).mergedWith({{"active_devices", large}})};
+    for (int change = 1; change <= 20; ++change)
+        payloads.push_back(at(change, {{"PomoSessionVolume", change % 2}, {"ringerstate", 1}}));
+    const Messages events = create(payloads);
+    ASSERT_THAT(events, SizeIs(20));
+    const auto first = events[0].find("active_devices")->string();
+    EXPECT_EQ(*first, large);
+    for (const Dictionary& event : events)
+        EXPECT_TRUE(event.find("active_devices")->string()->isSameObject(*first));
+    EXPECT_EQ(values(events, "ringerstate").front(), "0");
+    EXPECT_EQ(values(events, "ringerstate").back(), "1");
+}
+
+// Each would be written to the store and twice to the disk.
+TEST_F(VolumeMessages, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
+{
+    constexpr std::size_t size = std::size_t{1} << 20;
+    constexpr int changes = 100;
+    Messages payloads{startAt(0).mergedWith({{"active_devices", std::string(size, 'x')}})};
+    for (int change = 1; change <= changes; ++change)
+        payloads.push_back(at(change, {{"PomoSessionVolume", change % 2}}));
+    payloads.push_back(at(changes + 1, {{"active_devices", "small"}}));
+    payloads.push_back(stopAt(changes + 2));
+    const Messages events = create(payloads);
+    const std::size_t fit = KestoReportingSession::mostVolumeEventBytes / size - 1;
+    ASSERT_THAT(events, SizeIs(fit + 1)) << "a small one has room still";
+    EXPECT_EQ(*events.back().find("active_devices"), Value("small"));
+    EXPECT_EQ(values(events, "msgidx").back(), std::to_string(fit + 1));
+    EXPECT_EQ(values(events, "msgcnt").front(), std::to_string(fit + 1));
+    EXPECT_THAT(platform.log.lines("keri"),
+                testing::Contains(IsLine(Error, "keri",
+                                         std::to_string(changes + 1 - fit)
+                                             + " volume events are lost: with them there would be more than 67108864 "
+                                               "bytes"))
+                    .Times(1));
+}
+
 } // namespace

@@ -1,3 +1,4 @@
+// Lists of dictionaries, walked from the beginning for every question.
 #include "session/NaiveAggregation.h"
 
 #include <cmath>
