@@ -2,6 +2,7 @@
 #include "client/KestoReportingClientServerInstance.h"
 
 #include "client/KestoReportingServerQueue.h"
+#include "foundation/Format.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -9,11 +10,15 @@
 #include <cstdlib>
 
 namespace {
+
+std::atomic<std::size_t> sessionsOfTheService = 0; // of all clients, registered or not
+
 bool isRegistered(const KestoReportingServiceDelegateProtocol& delegate,
                   const KestoReportingClientServerInstance& client)
 {
     return std::ranges::any_of(delegate.getAllClients(), [&](const auto& other) { return other.get() == &client; });
 }
+
 } // namespace
 
 KestoReportingClientServerInstance::KestoReportingClientServerInstance(
@@ -28,9 +33,15 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
 
 KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
 {
+    sessionsOfTheService -= clientReportingSessionMap_.size();
     if (sessionsRefused_ != 0)
-        KESTO_LOG(KestoReportingClientCategory(), Error, "client {} was refused {} sessions: it may have {}",
-                  processIdentifier_, sessionsRefused_, mostSessions);
+        KESTO_LOG(KestoReportingClientCategory(), Error,
+                  "client {} was refused {} sessions: it may have {}, and all clients {}", processIdentifier_,
+                  sessionsRefused_, mostSessions, mostSessionsOfTheService);
+    if (receiversRefused_ != 0)
+        KESTO_LOG(KestoReportingClientCategory(), Error,
+                  "messages of client {} were not delivered {} times: one may take {} bytes at all who receive it",
+                  processIdentifier_, receiversRefused_, mostBytesOfADelivery);
     KESTO_LOG(KestoReportingClientCategory(), Default, "dealloc {} from the server client list", processIdentifier_);
 }
 
@@ -61,6 +72,7 @@ void KestoReportingClientServerInstance::setClientProcessName(std::optional<std:
 std::shared_ptr<KestoReportingSession>
 KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t reporterID, bool acrossAllClients) const
 {
+    KestoReportingAssertServerQueue();
     if (auto session = clientReportingSessionMap_.find(reporterID))
         return session;
     const auto delegate = acrossAllClients ? delegate_.lock() : nullptr;
@@ -69,14 +81,20 @@ KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t repor
 
 void KestoReportingClientServerInstance::addSession(std::int64_t reporterID, Session session)
 {
+    KestoReportingAssertServerQueue();
+    const std::size_t before = clientReportingSessionMap_.size();
     clientReportingSessionMap_.set(reporterID, std::move(session));
+    sessionsOfTheService += clientReportingSessionMap_.size() - before;
     if (const auto delegate = delegate_.lock())
         delegate->reporterIDAdded(reporterID, *this);
 }
 
 void KestoReportingClientServerInstance::removeSession(std::int64_t reporterID)
 {
+    KestoReportingAssertServerQueue();
+    const std::size_t before = clientReportingSessionMap_.size();
     clientReportingSessionMap_.remove(reporterID);
+    sessionsOfTheService -= before - clientReportingSessionMap_.size();
     if (const auto delegate = delegate_.lock())
         delegate->reporterIDRemoved(reporterID, *this);
 }
@@ -87,7 +105,9 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
         KESTO_LOG(KestoReportingClientCategory(), Debug, "creating session for reporter {}", reporterID);
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientCreate);
         const bool replaces = self.clientReportingSessionMap_.find(reporterID) != nullptr;
-        if (replaces || self.clientReportingSessionMap_.size() < mostSessions) {
+        const bool isRoom =
+            self.clientReportingSessionMap_.size() < mostSessions && sessionsOfTheService < mostSessionsOfTheService;
+        if (replaces || isRoom) {
             self.addSession(reporterID,
                             std::make_shared<KestoReportingSession>(reporterID, std::vector{self.processIdentifier_},
                                                                     self.budget_));
@@ -227,6 +247,8 @@ void KestoReportingClientServerInstance::reporterID(std::int64_t reporterID, Dic
 void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
 {
     submit([reply = std::move(reply)](auto& self) {
+        if (self.isConnectionLost_) // who asked very often and did not listen keeps nobody waiting
+            return;
         std::vector<foundation::Value> reporterIDs;
         if (const auto delegate = self.delegate_.lock())
             for (const auto& client : delegate->getAllClients())
@@ -245,6 +267,7 @@ void KestoReportingClientServerInstance::killService(SuccessReply)
 
 void KestoReportingClientServerInstance::handleConnectionError()
 {
+    isConnectionLost_ = true;
     submit([](auto& self) {
         const auto delegate = self.delegate_.lock();
         if (!delegate || !isRegistered(*delegate, self))
@@ -271,9 +294,17 @@ void KestoReportingClientServerInstance::logActiveSessions(KestoReportingService
 
 std::string KestoReportingDescriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions)
 {
+    constexpr std::size_t longest = std::size_t{24} << 10; // about what a line of the log shows
     std::vector<foundation::Value> descriptions;
-    descriptions.reserve(sessions.size());
-    for (const auto& session : sessions)
-        descriptions.emplace_back(session->description());
+    std::size_t length = 0;
+    for (const auto& session : sessions) {
+        if (length > longest) {
+            descriptions.emplace_back(foundation::format("... {} more", sessions.size() - descriptions.size()));
+            break;
+        }
+        const std::string description = session->description();
+        length += description.size();
+        descriptions.emplace_back(description);
+    }
     return foundation::Value(foundation::Array(std::move(descriptions))).text();
 }

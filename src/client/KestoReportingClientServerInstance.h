@@ -11,6 +11,7 @@
 #include "foundation/Mutex.h"
 #include "session/KestoReportingStorageBudget.h"
 
+#include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
@@ -22,8 +23,13 @@ class KestoReportingClientServerInstance final
     : public KestoReportingServiceProtocol,
       public std::enable_shared_from_this<KestoReportingClientServerInstance> {
 public:
-    // More sessions than that are not created; the client is answered as always.
+    // More sessions than that are not created, of a client or of all of them; the client is answered as always. The
+    // IDs of all must fit into one frame, which `getAllReporters` answers.
     static constexpr std::size_t mostSessions = 10'000;
+    static constexpr std::size_t mostSessionsOfTheService = 110'000;
+    // What a message takes, times its receivers; it is not delivered to those beyond, but to one at least. The client
+    // is answered as always.
+    static constexpr std::size_t mostBytesOfADelivery = std::size_t{64} << 20;
 
     KestoReportingClientServerInstance(std::int32_t processIdentifier,
                                        std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate);
@@ -83,8 +89,9 @@ private:
                       const SuccessReply& reply);
     static void stop(KestoReportingServiceDelegateProtocol& delegate, const Session& session);
     void deliverToReporters(KestoReportingServiceDelegateProtocol& delegate, const Message& message,
-                            const ReporterIDs& reporterIDs) const;
-    static void deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
+                            const ReporterIDs& reporterIDs);
+    void deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
+    [[nodiscard]] static std::size_t mostReceivers(const Message& message, std::size_t wanted);
     static void deliverStandalone(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
     static void deliverToSinks(KestoReportingServiceDelegateProtocol& delegate, const Message& message,
                                const Session& session);
@@ -101,9 +108,11 @@ private:
 
     std::shared_ptr<KestoReportingStorageBudget> budget_;
     std::uint64_t sessionsRefused_ = 0;
+    std::uint64_t receiversRefused_ = 0;
+    std::atomic<bool> isConnectionLost_ = false;
     mutable foundation::Mutex registrationLock_;
 };
 
-// The sessions' descriptions as one text for the log.
+// The sessions' descriptions as one text for the log, as many as a line of it shows.
 [[nodiscard]] std::string
 KestoReportingDescriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions);

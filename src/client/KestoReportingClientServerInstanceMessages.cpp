@@ -13,6 +13,9 @@
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
+#include <algorithm>
+#include <span>
+
 void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary message, AudioEventCategory category,
                                                      std::uint16_t type, std::optional<ReporterIDs> reporterIDs,
                                                      KestoReportingReply reply)
@@ -21,30 +24,37 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
     const platform::Connection* caller = platform::Connection::current();
     auto processName =
         KestoReportingUtilityProcessNameForPID(caller != nullptr ? caller->processIdentifier() : processIdentifier_);
-    submit([message = Message{std::move(message), category, type, std::move(processName).value_or("")},
+    submit([message = Message{std::move(message), category, type, std::move(processName).value_or("(null)")},
             reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
                   reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientSendMessage);
         const auto delegate = self.delegate_.lock();
-        if (!delegate || !delegate->isReportingEnabled())
+        if (!delegate)
+            return reply(std::nullopt);
+        if (!delegate->isReportingEnabled())
             return reply(KestoReportingErrorDisabled);
         if (reporterIDs)
             self.deliverToReporters(*delegate, message, *reporterIDs);
         else
-            deliverToActiveSessions(*delegate, message);
+            self.deliverToActiveSessions(*delegate, message);
         reply(std::nullopt);
     });
 }
 
 void KestoReportingClientServerInstance::deliverToReporters(KestoReportingServiceDelegateProtocol& delegate,
-                                                            const Message& message,
-                                                            const ReporterIDs& reporterIDs) const
+                                                            const Message& message, const ReporterIDs& reporterIDs)
 {
+    std::size_t room = mostReceivers(message, reporterIDs.size());
     for (const std::int64_t reporterID : reporterIDs) {
         const auto session = reporterID == 0 ? nullptr : findReportingSessionForID(reporterID, true);
         if (!session)
             continue;
+        if (room == 0) {
+            ++receiversRefused_;
+            continue;
+        }
+        --room;
         deliverToSinks(delegate, message, session);
         deliverToSession(message, session);
     }
@@ -56,12 +66,22 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(KestoReportingS
     const auto active = delegate.getAllActiveReportingSessions();
     KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active.size(),
               KestoReportingDescriptionOfSessions(active));
-    for (const auto& session : active) {
+    const std::size_t receivers = std::min(active.size(), mostReceivers(message, active.size()));
+    receiversRefused_ += active.size() - receivers;
+    for (const auto& session : std::span(active).first(receivers)) {
         deliverToSession(message, session);
         deliverToSinks(delegate, message, session);
     }
     if (active.empty())
         deliverStandalone(delegate, message);
+}
+
+// A message of a million bytes to ten thousand sessions would hold up all clients for a minute.
+std::size_t KestoReportingClientServerInstance::mostReceivers(const Message& message, std::size_t wanted)
+{
+    if (wanted <= 1)
+        return wanted;
+    return std::max<std::size_t>(mostBytesOfADelivery / message.payload.roughBytes(), 1);
 }
 
 void KestoReportingClientServerInstance::deliverStandalone(KestoReportingServiceDelegateProtocol& delegate,

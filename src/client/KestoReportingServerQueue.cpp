@@ -1,3 +1,4 @@
+// Where the queue is kept.
 #include "client/KestoReportingServerQueue.h"
 
 #include "platform/Platform.h"

@@ -29,7 +29,7 @@ public:
     [[nodiscard]] virtual bool isReportingEnabled() const = 0;
     // The started sessions of all clients, in the order of registration and then of creation.
     [[nodiscard]] virtual Sessions getAllActiveReportingSessions() = 0;
-    // The session of that ID which belongs to the client registered first, or null. Any thread.
+    // The session of that ID which belongs to the client registered first, or null.
     [[nodiscard]] virtual std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) = 0;
     // A sample of all audio drivers, by driver.
     [[nodiscard]] virtual KestoReportingDriverSnapShot getSnapShot() = 0;

@@ -73,8 +73,7 @@ public:
 
     template <typename Integer> Integer integer(std::string_view name)
     {
-        const auto number = next().number();
-        const auto exact = number ? number->exactly<Integer>() : std::nullopt;
+        const auto exact = next().exactly<Integer>();
         if (!exact)
             refuse(name,
                    foundation::format("an integer from {} to {}", std::numeric_limits<Integer>::min(),
@@ -92,26 +91,36 @@ public:
 
     std::optional<KestoReportingServiceProtocol::ReporterIDs> reporterIDs(std::string_view name)
     {
+        constexpr std::size_t most = KestoReportingServiceProtocolAdapter::mostReportersOfAMessage;
         const Value& value = next();
         if (value.isNull())
             return std::nullopt;
-        KestoReportingServiceProtocol::ReporterIDs reporterIDs;
         const auto array = value.array();
         if (!array)
             refuse(name, "an array or null");
-        for (const Value& element : array.value_or(Array())) {
-            const auto number = element.number();
-            const auto exact = number ? number->exactly<std::int64_t>() : std::nullopt;
-            if (!exact)
-                refuse(name, "an array of 64-bit integers");
-            reporterIDs.push_back(exact.value_or(0));
-        }
-        return reporterIDs;
+        else if (array->size() > most)
+            refuse(name, foundation::format("an array of at most {} elements", most));
+        return array && !refusal_ ? integers(*array, name) : KestoReportingServiceProtocol::ReporterIDs();
     }
 
     [[nodiscard]] const std::optional<std::string>& refusal() const { return refusal_; }
 
 private:
+    KestoReportingServiceProtocol::ReporterIDs integers(const Array& array, std::string_view name)
+    {
+        KestoReportingServiceProtocol::ReporterIDs integers;
+        integers.reserve(array.size());
+        for (const Value& element : array) {
+            const auto exact = element.exactly<std::int64_t>();
+            if (!exact) {
+                refuse(name, "an array of 64-bit integers");
+                break;
+            }
+            integers.push_back(*exact);
+        }
+        return integers;
+    }
+
     const Value& next()
     {
         const Value& value = rest_.front();
@@ -202,16 +211,15 @@ std::unexpected<Connection::Violation> violation(std::string reason)
 std::expected<void, Connection::Violation> KestoReportingServiceProtocolAdapter::handleCall(Connection::Call call)
 {
     constexpr std::size_t headCount = 2; // the call's number and the method's
-    const auto connection = connection_.lock();
-    if (!connection)
+    if (connection_.expired())
         return {};
     const std::span<const Value> values = call.frame.values();
     if (values.size() < headCount)
         return violation("a call is an array of a number, a method and its arguments");
-    const auto callNumber = values[0].number() ? values[0].number()->exactly<std::uint64_t>() : std::nullopt;
+    const auto callNumber = values[0].exactly<std::uint64_t>();
     if (!callNumber)
         return violation("a call's number is an unsigned 64-bit integer");
-    const auto methodNumber = values[1].number() ? values[1].number()->exactly<std::int64_t>() : std::nullopt;
+    const auto methodNumber = values[1].exactly<std::int64_t>();
     if (!methodNumber) // not repeated to the log, where it could fill a disk or forge lines
         return violation(foundation::format("a call's method is an integer from 1 to {}", methods.size()));
     if (*methodNumber < 1 || std::cmp_greater(*methodNumber, methods.size()))
@@ -221,7 +229,6 @@ std::expected<void, Connection::Violation> KestoReportingServiceProtocolAdapter:
         return violation(foundation::format("{} takes {} arguments, not {}", method.name, method.argumentCount,
                                             values.size() - headCount));
 
-    const Connection::CallScope scope(*connection);
     Arguments arguments(values.subspan(headCount));
     method.call(*exportedObject_, arguments, ReplyAddress(connection_, *callNumber, std::move(call.credit)));
     if (arguments.refusal())

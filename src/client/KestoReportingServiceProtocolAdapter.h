@@ -14,6 +14,9 @@
 // One a connection, which owns it; used on the connection's thread.
 class KestoReportingServiceProtocolAdapter {
 public:
+    // A message to more is refused: each of them is worth as much work as the message, and takes a byte of the frame.
+    static constexpr std::size_t mostReportersOfAMessage = 10'000;
+
     // Calls go to the exported object, replies to the connection as long as it lives.
     KestoReportingServiceProtocolAdapter(std::shared_ptr<KestoReportingServiceProtocol> exportedObject,
                                          const std::shared_ptr<platform::Connection>& connection)

@@ -1,9 +1,10 @@
 // A client's sessions by reporter ID, in the order in which their IDs first came.
 //
 // A replaced session leaves its place to the new one. Looking up, adding and removing cost the same whatever
-// the number of sessions.
+// the number of sessions and the IDs that clients choose.
 #pragma once
 
+#include "foundation/IntegerHash.h"
 #include "session/KestoReportingSession.h"
 
 #include <cstdint>
@@ -54,5 +55,5 @@ public:
 
 private:
     std::list<Entry> entries_;
-    std::unordered_map<std::int64_t, std::list<Entry>::iterator> byID_;
+    std::unordered_map<std::int64_t, std::list<Entry>::iterator, foundation::IntegerHash> byID_;
 };

@@ -132,6 +132,50 @@ TEST_F(MessagesTest, SkipZeroAndIDsThatNobodyHas)
     EXPECT_NE(recorded(player, 42), std::nullopt);
 }
 
+// A large message to many sessions would hold up all clients.
+TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
+{
+    constexpr std::int64_t sessions = 100;
+    constexpr std::size_t most = KestoReportingClientServerInstance::mostBytesOfADelivery;
+    std::vector<Value> reporterIDs{0, 4711};
+    for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID) {
+        makeSession(player, reporterID, false);
+        reporterIDs.emplace_back(reporterID);
+    }
+    const Dictionary large{{"a", std::string(1'000'000, 'x')}};
+    const auto receivers = static_cast<std::int64_t>(most / large.roughBytes());
+    ASSERT_LT(receivers, sessions);
+    EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered)) << "the client is answered as always";
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers)) << "and those that there are not do not count";
+    EXPECT_EQ(send(player, Array(reporterIDs)), answeredOnce(delivered));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * sessions)) << "a small one reaches all";
+
+    for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID)
+        player.call(StartReportingSessionForID, reporterID);
+    EXPECT_EQ(send(recorder, null, large), answeredOnce(delivered));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers));
+
+    platform.analytics.clear();
+    player.close();
+    recorder.close();
+    const auto refused = [&](int pid) {
+        return IsLine(Error, "kerc",
+                      "messages of client " + std::to_string(pid) + " were not delivered "
+                          + std::to_string(sessions - receivers)
+                          + " times: one may take 67108864 bytes at all who receive it");
+    };
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1001)).Times(1));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1002)).Times(1));
+}
+
+TEST_F(MessagesTest, AreDeliveredToOneSessionWhateverTheirSize)
+{
+    makeSession(player, 42);
+    EXPECT_EQ(send(player, Array{42}, {{"a", Array(std::vector<Value>(500'000, Value(Array{})))}}),
+              answeredOnce(delivered));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2));
+}
+
 TEST_F(MessagesTest, ToAnEmptyListReachNobody)
 {
     makeSession(player, 42);
@@ -342,7 +386,7 @@ TEST_F(ClientAndServiceTest, HandsTheMessageItsSessionAndTheSendersNameToTheBugC
     platform.processTable.add(18, "caller");
     EXPECT_CALL(*service, handleEventForVorp(Dictionary{{"a", 1}}, 0x10000004, 2, session(42), "caller"));
     EXPECT_CALL(*service, handleEventForVorp(_, _, _, session(42), "client"));
-    EXPECT_CALL(*service, handleEventForVorp(_, _, _, session(42), ""));
+    EXPECT_CALL(*service, handleEventForVorp(_, _, _, session(42), "(null)"));
     {
         // Whoever makes the call, not whoever the client was made for.
         const FakeConnection callers(18);

@@ -1,6 +1,7 @@
 // A client's operations on sessions, called through the protocol: what is answered, what is said in which order, and
 // whose sessions each of them reaches.
 #include "client/KestoReportingClientServerInstance.h"
+#include "platform/linux/FrameReader.h"
 #include "support/ServiceHarness.h"
 
 #include <gmock/gmock.h>
@@ -179,7 +180,41 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanItMayHave)
     harness.forget();
     player.close();
     EXPECT_THAT(platform.log.lines("kerc"),
-                testing::Contains(IsLine(Error, "kerc", "client 1001 was refused 1 sessions: it may have 10000")));
+                testing::Contains(IsLine(
+                    Error, "kerc", "client 1001 was refused 1 sessions: it may have 10000, and all clients 110000")));
+}
+
+// All their IDs are answered in one frame.
+TEST_F(ClientTest, CreatesNoMoreSessionsThanAllClientsMayHaveTogether)
+{
+    constexpr std::size_t longestID = 9; // bytes of CBOR
+    constexpr std::size_t restOfAnAnswer = 32;
+    constexpr std::size_t most = KestoReportingClientServerInstance::mostSessionsOfTheService;
+    static_assert(most * longestID + restOfAnAnswer <= platform::longestFrame);
+
+    std::vector<std::shared_ptr<KestoReportingClientServerInstance>> clients;
+    std::size_t sessions = 0;
+    const auto fill = [&](std::size_t count) {
+        clients.push_back(std::make_shared<KestoReportingClientServerInstance>(17, harness.service));
+        for (std::size_t index = 0; index < count; ++index)
+            clients.back()->createReportingSession(static_cast<std::int64_t>(index), [](const auto&, bool) { });
+        platform.workQueues.runAll();
+        platform.log.clear();
+        platform.traceMarkers.take();
+        sessions += clients.back()->clientReportingSessionMap().size();
+    };
+    while (clients.size() < most / KestoReportingClientServerInstance::mostSessions)
+        fill(KestoReportingClientServerInstance::mostSessions);
+    EXPECT_EQ(sessions, most);
+    fill(3);
+    EXPECT_EQ(sessions, most);
+    clients.pop_back();
+    EXPECT_THAT(platform.log.lines("kerc"),
+                testing::Contains(IsLine(
+                    Error, "kerc", "client 17 was refused 3 sessions: it may have 10000, and all clients 110000")));
+    clients.pop_back();
+    fill(3);
+    EXPECT_EQ(clients.back()->clientReportingSessionMap().size(), 3U) << "those of a client that goes make room";
 }
 
 // --- set service type
@@ -615,6 +650,40 @@ TEST_F(ClientTest, ListsTheReportersOfAllClientsInOrder)
     EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
 }
 
+TEST_F(ClientTest, ListsNothingForWhoIsGone)
+{
+    create(42);
+    const auto call = player.submit(GetAllReporters, {});
+    player.connection().close();
+    platform.workQueues.runAll();
+    EXPECT_THAT(player.answersTo(call), IsEmpty());
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U);
+    EXPECT_EQ(recorder.call(GetAllReporters), answeredOnce({null, Array{}}));
+}
+
+// --- what the log shows of many sessions
+
+TEST_F(ClientTest, DescribesNoMoreSessionsThanALogLineShows)
+{
+    constexpr std::int64_t sessions = 2000;
+    constexpr std::size_t longestLine = 64 * 1024;
+    const Dictionary configuration{{"HostApplicationDisplayID", std::string(1024, 'x')}};
+    for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID) {
+        player.submit(CreateReportingSession, {reporterID});
+        player.submit(SetConfiguration, {configuration, reporterID});
+    }
+    platform.workQueues.runAll();
+    harness.forget();
+    start(1);
+    for (const LogLine& line : platform.log.lines())
+        EXPECT_LT(line.message.size(), longestLine);
+    EXPECT_THAT(platform.log.lines("kers"),
+                testing::Contains(
+                    testing::Field("message", &LogLine::message,
+                                   testing::AllOf(testing::StartsWith("sessions for client 1001 : [\"reporterID=1,"),
+                                                  testing::EndsWith(" more\"]")))));
+}
+
 // --- kill
 
 class ClientDeathTest : public ClientTest {
@@ -705,8 +774,14 @@ TEST_F(ClientTest, DoesNothingFurtherOnceTheServiceIsGone)
     harness.forget();
     orphan->createReportingSession(42, [](const auto&, bool) { });
     orphan->startReportingSessionForID(42, [](const auto&, bool) { });
+    std::vector<std::optional<KestoReportingError>> answers;
+    const auto note = [&](const auto& error) { answers.push_back(error); };
+    orphan->sendMessage({{"a", 1}}, 4, 1, std::vector<std::int64_t>{42}, note);
+    orphan->sendMessage({{"a", 1}}, 4, 1, std::nullopt, note);
     orphan->handleConnectionError();
     platform.workQueues.runAll();
+    EXPECT_THAT(answers, ElementsAre(std::nullopt, std::nullopt)) << "reporting is not disabled";
+    EXPECT_THAT(platform.analytics.asked(), IsEmpty());
     EXPECT_FALSE(orphan->clientReportingSessionMap().find(42)->started());
     EXPECT_THAT(platform.log.lines("kers"), IsEmpty());
 }

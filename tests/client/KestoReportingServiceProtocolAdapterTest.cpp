@@ -114,15 +114,6 @@ TEST_F(AdapterTest, TakesIntegersUpToTheEndsOfTheirRanges)
     accept({1, 6, Dictionary{}, 0xFFFFFFFFU, 0xFFFF, null});
 }
 
-TEST_F(AdapterTest, MakesItsConnectionTheCurrentOneDuringTheCallOnly)
-{
-    EXPECT_CALL(*protocol, getAllReporters).WillOnce([this] { EXPECT_EQ(Connection::current(), connection.get()); });
-    accept({1, 10});
-    EXPECT_EQ(Connection::current(), nullptr);
-    EXPECT_NE(refusal({1, 1, "x"}), std::nullopt);
-    EXPECT_EQ(Connection::current(), nullptr);
-}
-
 // --- what is refused
 
 TEST_F(AdapterTest, RefusesWhatIsNoCall)
@@ -268,8 +259,20 @@ TEST_F(AdapterTest, RefusesListsOfAnythingButIntegers)
     for (const Value& element : wrong)
         EXPECT_EQ(refusal({1, 6, Dictionary{}, 4, 1, Array{42, element, 43}}),
                   "sendMessage: argument reporter IDs is not an array of 64-bit integers");
+}
+
+// A message is worth as much work at each of them, and each takes no more than a byte of the frame.
+TEST_F(AdapterTest, RefusesListsOfMoreReportersThanAMessageMayHave)
+{
+    constexpr std::size_t most = KestoReportingServiceProtocolAdapter::mostReportersOfAMessage;
+    const auto listOf = [](std::size_t count) { return Array(std::vector<Value>(count, Value(42))); };
+    using testing::_;
+    EXPECT_CALL(*protocol, sendMessage(_, _, _, Optional(testing::SizeIs(most)), _));
+    accept({1, 6, Dictionary{}, 4, 1, listOf(most)});
+    EXPECT_EQ(refusal({1, 6, Dictionary{}, 4, 1, listOf(most + 1)}),
+              "sendMessage: argument reporter IDs is not an array of at most 10000 elements");
     EXPECT_EQ(refusal({1, 6, Dictionary{}, 4, 1, Array(std::vector<Value>(300'000, Value("x")))}),
-              "sendMessage: argument reporter IDs is not an array of 64-bit integers");
+              "sendMessage: argument reporter IDs is not an array of at most 10000 elements");
 }
 
 // --- what is answered

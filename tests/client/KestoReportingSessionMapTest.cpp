@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <gtest/gtest.h>
 #include <rapidcheck/gtest.h>
+#include <unordered_set>
 #include <utility>
 #include <vector>
 
@@ -37,6 +38,27 @@ TEST_F(SessionMapTest, BeginsEmpty)
     EXPECT_EQ(map.size(), 0U);
     EXPECT_EQ(map.find(0), nullptr);
     EXPECT_EQ(map.begin(), map.end());
+}
+
+// Whoever knows how many buckets there are could otherwise have all IDs in one of them.
+TEST(SessionMapHash, SpreadsIDsWhateverTheirDistance)
+{
+    constexpr std::size_t count = 10'000;
+    for (const std::int64_t distance :
+         {std::int64_t{1}, std::int64_t{13}, std::int64_t{10'273}, std::int64_t{1} << 32}) {
+        std::unordered_set<std::int64_t, foundation::IntegerHash> reporterIDs;
+        for (std::size_t index = 0; index < count; ++index)
+            reporterIDs.insert(static_cast<std::int64_t>(index) * distance);
+        std::unordered_set<std::int64_t, foundation::IntegerHash> multiples;
+        for (std::size_t index = 0; index < count; ++index)
+            multiples.insert(static_cast<std::int64_t>(index * reporterIDs.bucket_count()));
+        for (const auto& set : {reporterIDs, multiples}) {
+            std::size_t fullest = 0;
+            for (std::size_t bucket = 0; bucket < set.bucket_count(); ++bucket)
+                fullest = std::max(fullest, set.bucket_size(bucket));
+            EXPECT_LT(fullest, 20U) << distance;
+        }
+    }
 }
 
 TEST_F(SessionMapTest, KeepsTheOrderInWhichIDsCame)
