@@ -27,7 +27,6 @@ public:
             if (!message_.contains(KestoReportingHostApplicationKey))
                 message_ = message_.with(KestoReportingHostApplicationKey,
                                          KestoReportingUtilityRetrieveAppName(session_->configuration()));
-            session_.reset();
         });
         return message_;
     }
@@ -35,7 +34,7 @@ public:
 private:
     std::once_flag built_;
     foundation::Dictionary message_;
-    std::shared_ptr<const KestoReportingSinkSession> session_;
+    const std::shared_ptr<const KestoReportingSinkSession> session_;
 };
 
 // The names of a message's two events.

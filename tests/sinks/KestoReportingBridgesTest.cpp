@@ -5,6 +5,7 @@
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>
+#include <thread>
 
 namespace {
 
@@ -40,6 +41,32 @@ TEST_F(FennicBridgeTest, OffersAnEventForAllServicesAndThenOneForTheSessionsOwn)
                 ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.telephony.Playback.Start"));
     EXPECT_THAT(platform.analytics.sent(),
                 ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.telephony.Playback.Start"));
+}
+
+TEST_F(FennicBridgeTest, SendsTheFirstEventBeforeItAsksAboutTheSecond)
+{
+    platform.analytics.use("*");
+    std::vector<std::size_t> sentBefore;
+    platform.analytics.setObserver([&](const std::string&) { sentBefore.push_back(platform.analytics.sent().size()); });
+    send({});
+    platform.analytics.setObserver(nullptr);
+    EXPECT_THAT(sentBefore, ElementsAre(0, 1));
+}
+
+TEST_F(FennicBridgeTest, BuildsThePayloadOfBothEventsOnSeveralThreadsAtOnce)
+{
+    platform.analytics.use("*");
+    for (int round = 0; round < 100; ++round) {
+        send({{"a", round}});
+        std::vector<std::jthread> threads;
+        for (auto& builder : platform.analytics.takeBuilders())
+            threads.emplace_back([&session = session, round, builder = std::move(builder)]() mutable {
+                EXPECT_EQ(builder(), (Dictionary{{"a", round}, {"HostApplicationDisplayID", "Unknown"}}));
+                EXPECT_GT(session.use_count(), 1) << "until it is released";
+            });
+        EXPECT_EQ(threads.size(), 2U);
+    }
+    EXPECT_EQ(session.use_count(), 1);
 }
 
 TEST_F(FennicBridgeTest, NamesEventsByCategoryTypeAndService)

@@ -57,6 +57,15 @@ std::vector<foundation::Dictionary> FakeAnalytics::payloads(std::string_view nam
     return payloads;
 }
 
+std::vector<platform::Analytics::PayloadBuilder> FakeAnalytics::takeBuilders()
+{
+    const foundation::Lock lock(lock_);
+    std::vector<PayloadBuilder> builders;
+    for (auto& event : std::exchange(sent_, {}))
+        builders.push_back(std::move(event.builder));
+    return builders;
+}
+
 int FakeAnalytics::timesBuilt() const
 {
     const foundation::Lock lock(lock_);

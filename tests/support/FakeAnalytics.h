@@ -35,6 +35,8 @@ public:
     // The events sent, their payloads built now unless they were before; of one name in the second form.
     [[nodiscard]] std::vector<AnalyticsEvent> events();
     [[nodiscard]] std::vector<foundation::Dictionary> payloads(std::string_view name);
+    // The builders of the events sent, in order, for who builds the payloads; the events are forgotten.
+    [[nodiscard]] std::vector<PayloadBuilder> takeBuilders();
     // How many payloads were built.
     [[nodiscard]] int timesBuilt() const;
     // Forgets everything but what is wanted, and lets go of the payloads not built.
