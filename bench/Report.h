@@ -21,6 +21,7 @@ struct Target {
     double limit;
 
     static constexpr Target figureAtMost(double limit) { return {Of::Figure, Bound::AtMost, limit}; }
+    static constexpr Target figureAtLeast(double limit) { return {Of::Figure, Bound::AtLeast, limit}; }
     static constexpr Target ratioAtMost(double limit) { return {Of::Ratio, Bound::AtMost, limit}; }
     static constexpr Target ratioAtLeast(double limit) { return {Of::Ratio, Bound::AtLeast, limit}; }
 };
