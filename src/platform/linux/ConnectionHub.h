@@ -14,12 +14,15 @@
 
 namespace platform {
 
+class TraceMarkerAccess;
+
 // What happened since the listener was made. Any thread.
 struct ConnectionCounters {
     std::atomic<std::uint64_t> accepted; // connections
     std::atomic<std::uint64_t> interrupted; // connections that broke, by the peer's fault or ours
     std::atomic<std::uint64_t> droppedBytes; // of frames that were to be sent to connections that were over
     std::atomic<std::uint64_t> readingPauses; // times that reading from a client stopped until it was less behind
+    std::atomic<std::uint64_t> refused; // connections of a user who had as many as one may have
     std::atomic<std::uint64_t> acceptingPauses; // times that new clients had to wait for a descriptor
 };
 
@@ -29,6 +32,7 @@ struct ConnectionHub {
     FileDescriptor epoll; // watches the sockets; changed by any thread, waited for by the connection thread
     LogCategory& log;
     ConnectionCounters counters = {};
+    TraceMarkerAccess* traceAccess = nullptr; // null: nobody ever traces
 
     std::thread::id connectionThread = {}; // from its start on
     [[nodiscard]] bool isConnectionThread() const { return connectionThread == std::this_thread::get_id(); }

@@ -6,8 +6,10 @@
 #include "platform/linux/SerialQueue.h"
 #include "platform/linux/SystemErrorText.h"
 
+#include <array>
 #include <cassert>
 #include <cerrno>
+#include <cstring>
 #include <fmt/format.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
@@ -20,6 +22,34 @@ namespace {
 constexpr std::uint64_t unansweredCall(std::size_t bytes) noexcept
 {
     return std::uint64_t{1} << 32 | bytes;
+}
+
+// The one request beside the calls of the service's operations.
+bool asksForTraceMarker(const foundation::Array& frame)
+{
+    if (frame.size() != 2)
+        return false;
+    const auto method = frame[1].string();
+    return method && method->view() == "trace";
+}
+
+// Sends what the socket takes, and the descriptors with the first byte.
+ssize_t sendWithDescriptors(int socket, std::string_view bytes, const TraceDescriptors& descriptors)
+{
+    const std::array numbers{descriptors.marker, descriptors.page};
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof numbers)> control{};
+    iovec part = {const_cast<char*>(bytes.data()), bytes.size()};
+    msghdr message = {};
+    message.msg_iov = &part;
+    message.msg_iovlen = 1;
+    message.msg_control = control.data();
+    message.msg_controllen = control.size();
+    cmsghdr* const head = CMSG_FIRSTHDR(&message);
+    head->cmsg_level = SOL_SOCKET;
+    head->cmsg_type = SCM_RIGHTS;
+    head->cmsg_len = CMSG_LEN(sizeof numbers);
+    std::memcpy(CMSG_DATA(head), numbers.data(), sizeof numbers);
+    return ::sendmsg(socket, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
 }
 
 constexpr bool areTooManyUnanswered(std::uint64_t unanswered) noexcept
@@ -158,6 +188,11 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
         auto array = value->array();
         if (!array)
             return std::unexpected(Violation{"a frame is not an array"});
+        if (asksForTraceMarker(*array)) {
+            if (auto asked = askForTraceMarker((*array)[0]); !asked)
+                return asked;
+            continue;
+        }
         const std::size_t size = (*frame)->size();
         unanswered_.fetch_add(unansweredCall(size));
         hub_->calls.push_back({*std::move(array), std::make_shared<Credit>(shared_from_this(), size)});
@@ -175,6 +210,39 @@ std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
     }
     hub_->calls.clear();
     return result;
+}
+
+// Not one of the service's calls: it is about the connection's own means, and no other part of the service learns of
+// it. Once a connection, so that nobody can have the service keep requests or descriptors in any number.
+std::expected<void, Connection::Violation> LinuxConnection::askForTraceMarker(const foundation::Value& call)
+{
+    const auto number = call.number() ? call.number()->exactly<std::uint64_t>() : std::nullopt;
+    if (!number)
+        return std::unexpected(Violation{"a call's number is an unsigned 64-bit integer"});
+    if (std::exchange(hasAskedForTraceMarker_, true))
+        return std::unexpected(Violation{"it asks for the trace marker twice"});
+    if (hub_->traceAccess != nullptr)
+        hub_->traceAccess->ask(this, [weak = weak_from_this(), number = *number](const TraceDescriptors& descriptors) {
+            if (const auto self = weak.lock())
+                self->handOver(number, descriptors);
+        });
+    return {};
+}
+
+// Ahead of what a turn of the server queue holds back: nothing is kept for this answer.
+void LinuxConnection::handOver(std::uint64_t call, const TraceDescriptors& descriptors)
+{
+    std::string frame;
+    foundation::appendCborArrayHead(2, frame);
+    foundation::appendCborInteger(call, frame);
+    foundation::appendCborNull(frame);
+    const foundation::Lock lock(lock_);
+    if (isOver_ || breakReason_ || cannotSend_)
+        return;
+    handOver_ = {output_.size(), descriptors};
+    appendFrame(frame, output_);
+    unsentBytes_ += frameHeadSize + frame.size();
+    writeOutput();
 }
 
 void LinuxConnection::returnCredit(std::size_t bytes)
@@ -223,8 +291,7 @@ void LinuxConnection::writeOutput()
 {
     if (isOver_ || output_.empty())
         return;
-    const std::string_view rest = std::string_view(output_).substr(outputStart_);
-    const ssize_t count = ::send(socket_.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+    const ssize_t count = sendOutput();
     if (count >= 0) {
         unsentBytes_ -= static_cast<std::size_t>(count);
         outputStart_ += static_cast<std::size_t>(count);
@@ -238,16 +305,36 @@ void LinuxConnection::writeOutput()
     } else if (outputStart_ > output_.size() / 2) { // so that moving costs less than sending did
         output_.erase(0, outputStart_);
         outputStart_ = 0;
+        if (handOver_)
+            handOver_->place -= outputStart_;
     }
     watch();
 }
 
 void LinuxConnection::dropOutput()
+// Descriptors go with the first byte of their frame. When the system has none to spare, because clients do not take
+// theirs, the frame goes without.
+ssize_t LinuxConnection::sendOutput()
+{
+    std::string_view rest = std::string_view(output_).substr(outputStart_);
+    if (handOver_ && handOver_->place == outputStart_) {
+        const ssize_t count = sendWithDescriptors(socket_.get(), rest, handOver_->descriptors);
+        if (count > 0 || errno == ETOOMANYREFS)
+            handOver_.reset();
+        if (count > 0 || handOver_)
+            return count;
+    } else if (handOver_) {
+        rest = rest.substr(0, handOver_->place - outputStart_);
+    }
+    return ::send(socket_.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
+}
+
 {
     drop(output_.size() - outputStart_);
     std::string().swap(output_);
     outputStart_ = 0;
 }
+    handOver_.reset();
 
 void LinuxConnection::drop(std::size_t bytes)
 {
@@ -310,6 +397,8 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
     EndHandler invalidated = std::exchange(invalidationHandler_, nullptr);
     if (interruptedBecause) {
         ++hub_->counters.interrupted;
+    if (hasAskedForTraceMarker_ && hub_->traceAccess != nullptr)
+        hub_->traceAccess->forget(this);
         KESTO_LOG(hub_->log, Default, "{} ends: {}", description(), *interruptedBecause);
         if (interrupted)
             interrupted();

@@ -15,6 +15,7 @@
 #include "platform/linux/ConnectionHub.h"
 #include "platform/linux/FileDescriptor.h"
 #include "platform/linux/FrameReader.h"
+#include "platform/linux/TraceMarkerAccess.h"
 
 #include <atomic>
 #include <cstdint>
@@ -64,6 +65,10 @@ public:
 private:
     class Credit;
 
+    struct HandOver {
+        std::size_t place; // in the output, where the frame begins that they go with
+        TraceDescriptors descriptors;
+    };
     [[nodiscard]] bool isBrokenOff();
     [[nodiscard]] bool settle();
     void read();
@@ -72,6 +77,8 @@ private:
     [[nodiscard]] std::expected<void, Violation> decodeFrames();
     [[nodiscard]] std::expected<void, Violation> deliverCalls();
     void breakOff(std::string reason);
+    [[nodiscard]] std::expected<void, Violation> askForTraceMarker(const foundation::Value& call);
+    void handOver(std::uint64_t call, const TraceDescriptors& descriptors);
     void end(std::optional<std::string> interruptedBecause);
 
     void returnCredit(std::size_t bytes);
@@ -79,6 +86,7 @@ private:
     void drop(std::size_t bytes);
     void writeOutput() KESTO_REQUIRES(lock_);
     void dropOutput() KESTO_REQUIRES(lock_);
+    [[nodiscard]] ssize_t sendOutput() KESTO_REQUIRES(lock_);
     void watch() KESTO_REQUIRES(lock_);
 
     const std::shared_ptr<ConnectionHub> hub_;
@@ -91,6 +99,7 @@ private:
     FrameReader reader_;
     foundation::CborDecoder decoder_;
 
+    bool hasAskedForTraceMarker_ = false;
     // How far behind the client is.
     std::atomic<std::uint64_t> unanswered_; // calls in the upper half, their bytes in the lower half
     std::atomic<std::size_t> unsentBytes_; // from `send` until the socket took them
@@ -102,6 +111,7 @@ private:
     std::uint32_t watchedEvents_ KESTO_GUARDED_BY(lock_) = 0;
     std::optional<std::string> breakReason_ KESTO_GUARDED_BY(lock_);
     bool isResumed_ KESTO_GUARDED_BY(lock_) = false;
+    std::optional<HandOver> handOver_ KESTO_GUARDED_BY(lock_);
     bool isOver_ KESTO_GUARDED_BY(lock_) = false;
     bool cannotSend_ KESTO_GUARDED_BY(lock_) = false; // the peer takes nothing any more
 };

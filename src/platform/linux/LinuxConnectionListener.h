@@ -40,6 +40,8 @@ public:
     // Called by `resume` when clients that connect from now on are served. Before `resume`.
     void setListeningHandler(std::move_only_function<void()> handler) { listeningHandler_ = std::move(handler); }
     void resume() override;
+    // Who hands out the marker of the kernel's trace to clients that ask. Before `resume`.
+    void setTraceAccess(TraceMarkerAccess& access) { hub_->traceAccess = &access; }
     // Makes `resume` end all connections and return. Any thread.
     void stop() override;
 

@@ -36,6 +36,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       reportingChannels_(launch.channelRoot, launch.soundRoot, ProviderLog(log_)),
       bugCapture_(launch.stateDirectory, {.log = log_.recentLines(), .clock = clock_, .workQueues = workQueues_},
                   ProviderLog(log_)),
+      kernelTrace_(TracefsPlace(), traceMarkers_, traceMarkerAccess_, ProviderLog(log_)),
       performanceWriter_(fileSystem_, ProviderLog(log_)),
       analytics_(launch.stateDirectory, configurationWatcher_, clock_, ProviderLog(log_))
 {

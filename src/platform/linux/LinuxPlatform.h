@@ -7,7 +7,6 @@
 //     platform::install(providers.platform());
 #pragma once
 
-#include "platform/Absent.h"
 #include "platform/Platform.h"
 #include "platform/linux/AnalyticsStore.h"
 #include "platform/linux/ConfigurationWatcher.h"
@@ -24,6 +23,9 @@
 #include "platform/linux/LinuxProcessTable.h"
 #include "platform/linux/LinuxReportingChannels.h"
 #include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/TraceMarkerAccess.h"
+#include "platform/linux/TracefsKernelTrace.h"
+#include "platform/linux/TracefsMarkers.h"
 
 namespace platform {
 
@@ -35,6 +37,8 @@ public:
     [[nodiscard]] Platform platform();
     // What the bundle does not show: how many events were kept and lost, and a way to write all that were sent.
     [[nodiscard]] AnalyticsStore& analyticsStore() noexcept { return analytics_; }
+    // What the listener hands out to clients.
+    [[nodiscard]] TraceMarkerAccess& traceMarkerAccess() noexcept { return traceMarkerAccess_; }
 
 private:
     LinuxLog log_;
@@ -46,10 +50,11 @@ private:
     LinuxDeviceProperties deviceProperties_;
     LinuxProcessTable processTable_;
     LinuxFileSystem fileSystem_;
-    AbsentTraceMarkers traceMarkers_;
+    TracefsMarkers traceMarkers_;
+    TraceMarkerAccess traceMarkerAccess_;
     LinuxReportingChannels reportingChannels_;
     LinuxBugCapture bugCapture_;
-    AbsentKernelTrace kernelTrace_;
+    TracefsKernelTrace kernelTrace_;
     LinuxPerformanceWriter performanceWriter_;
     AnalyticsStore analytics_;
     LinuxWorkQueues workQueues_; // ends first, for its turns end in the store

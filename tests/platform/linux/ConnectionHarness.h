@@ -214,6 +214,8 @@ protected:
         listener = *std::move(created);
         listener->setDelegate(*this);
         bool isListening = false;
+        if (beforeListening)
+            beforeListening();
         listener->setListeningHandler([&] { progress.change([&] { isListening = true; }); });
         thread = std::thread([this] { listener->resume(); });
         ASSERT_TRUE(progress.waitFor([&] { return isListening; }));
@@ -280,6 +282,7 @@ protected:
     TestPlatform platform;
     TemporaryDirectory directory;
     const std::filesystem::path path = directory.path() / "socket";
+    std::function<void()> beforeListening; // what is to be set on the listener
     Progress progress;
     std::vector<std::shared_ptr<ConnectionRecord>> records;
     bool accepts = true;
