@@ -18,6 +18,7 @@ void measureLogStatement(const Options& options, Report& report);
 void measureClientLibrary(const Options& options, Report& report);
 void measureChannels(const Options& options, Report& report);
 void measureDecoding(const Options& options, Report& report);
+void measureRecord(const Options& options, Report& report);
 void measureTrace(const Options& options, Report& report);
 
 } // namespace bench

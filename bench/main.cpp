@@ -33,6 +33,7 @@ constexpr std::array groups{
     Group{"library", "sending with libkesto, as its caller sees it", measureClientLibrary},
     Group{"channels", "driver channels: sampled, compared, published", measureChannels},
     Group{"decoding", "CBOR, and keeping a payload", measureDecoding},
+    Group{"record", "the diagnostics record to bytes and back", measureRecord},
     Group{"trace", "pairing the events of a trace, and its stop", measureTrace},
 };
 

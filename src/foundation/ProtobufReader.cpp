@@ -30,7 +30,7 @@ bool ProtobufReader::fail(ProtobufError error) noexcept
 
 // Seven bits a byte, the lowest first; the highest bit of a byte says that another one follows. A number may be
 // written longer than it needs to be, but not longer than the largest of its type.
-template <typename Integer> bool ProtobufReader::takeVarint(Integer& value) noexcept
+template <typename Integer> bool ProtobufReader::takeLongVarint(Integer& value) noexcept
 {
     constexpr int bits = std::numeric_limits<Integer>::digits;
     constexpr int lastShift = (bits - 1) / 7 * 7;
@@ -48,6 +48,9 @@ template <typename Integer> bool ProtobufReader::takeVarint(Integer& value) noex
     return fail(ProtobufError::Truncated);
 }
 
+template bool ProtobufReader::takeLongVarint(std::uint32_t&) noexcept;
+template bool ProtobufReader::takeLongVarint(std::uint64_t&) noexcept;
+
 template <typename Integer> bool ProtobufReader::takeFixed(std::uint64_t& value) noexcept
 {
     Integer taken = 0;
@@ -57,39 +60,6 @@ template <typename Integer> bool ProtobufReader::takeFixed(std::uint64_t& value)
     at_ += sizeof taken;
     value = std::endian::native == std::endian::big ? std::byteswap(taken) : taken;
     return true;
-}
-
-bool ProtobufReader::takeBytes(std::string_view& bytes) noexcept
-{
-    std::uint32_t length = 0;
-    if (!takeVarint(length))
-        return false;
-    if (static_cast<std::size_t>(end_ - at_) < length)
-        return fail(ProtobufError::Truncated);
-    bytes = {at_, length};
-    at_ += length;
-    return true;
-}
-
-bool ProtobufReader::takeTag(ProtobufField& field) noexcept
-{
-    std::uint32_t tag = 0;
-    if (!takeVarint(tag))
-        return false;
-    field.number = tag >> 3;
-    field.wireType = static_cast<ProtobufWireType>(tag & 7);
-    return (field.number != 0 && field.wireType <= ProtobufWireType::Fixed32) || fail(ProtobufError::InvalidTag);
-}
-
-// Of every wire type but the two of groups.
-bool ProtobufReader::takeValue(ProtobufField& field) noexcept
-{
-    switch (field.wireType) {
-    case ProtobufWireType::Varint: return takeVarint(field.integer);
-    case ProtobufWireType::Fixed64: return takeFixed<std::uint64_t>(field.integer);
-    case ProtobufWireType::Fixed32: return takeFixed<std::uint32_t>(field.integer);
-    default: return takeBytes(field.bytes);
-    }
 }
 
 // A group that has begun, up to its end.
@@ -119,21 +89,13 @@ bool ProtobufReader::takeGroup(std::uint32_t number, std::string_view& content) 
     }
 }
 
-std::optional<ProtobufField> ProtobufReader::next() noexcept
+bool ProtobufReader::takeRareValue(ProtobufField& field) noexcept
 {
-    ProtobufField field;
-    if (at_ == end_ || !takeTag(field))
-        return std::nullopt;
     switch (field.wireType) {
-    case ProtobufWireType::EndGroup: fail(ProtobufError::UnmatchedEndGroup); return std::nullopt;
-    case ProtobufWireType::Group:
-        if (!takeGroup(field.number, field.bytes))
-            return std::nullopt;
-        return field;
-    default:
-        if (!takeValue(field))
-            return std::nullopt;
-        return field;
+    case ProtobufWireType::Fixed64: return takeFixed<std::uint64_t>(field.integer);
+    case ProtobufWireType::Fixed32: return takeFixed<std::uint32_t>(field.integer);
+    case ProtobufWireType::Group: return takeGroup(field.number, field.bytes);
+    default: return fail(ProtobufError::UnmatchedEndGroup);
     }
 }
 
