@@ -129,11 +129,11 @@ bool LinuxConnection::settle()
         const foundation::Lock lock(lock_);
         if (isOver_)
             return false;
-        if (!breakReason_) {
+        if (!breakReason_ && !peerIsDone_) {
             watch();
             return true;
         }
-        reason = breakReason_;
+        reason = breakReason_; // which counts also when the peer closed at the same moment
     }
     end(std::move(reason));
     return false;
@@ -158,7 +158,7 @@ void LinuxConnection::endOfStream()
     if (reader_.isInsideFrame())
         breakOff("the stream ends inside a frame");
     else
-        end(std::nullopt);
+        peerIsDone_ = true;
 }
 
 // Everything is decoded before anything is delivered: delivering alone is so quick that the queue which the
@@ -275,9 +275,10 @@ void LinuxConnection::send(std::string frame)
 void LinuxConnection::write(std::string frames)
 {
     const foundation::Lock lock(lock_);
-    if (isOver_ || breakReason_ || cannotSend_)
-        return drop(frames.size());
-    if (!output_.empty()) {
+    if (isOver_ || breakReason_ || cannotSend_) {
+        drop(frames.size());
+        watch(); // it is less behind now, and may still be read from
+    } else if (!output_.empty()) {
         output_ += frames; // behind what waits for room already
         watch();
     } else {
@@ -304,14 +305,13 @@ void LinuxConnection::writeOutput()
         outputStart_ = 0;
     } else if (outputStart_ > output_.size() / 2) { // so that moving costs less than sending did
         output_.erase(0, outputStart_);
-        outputStart_ = 0;
         if (handOver_)
             handOver_->place -= outputStart_;
+        outputStart_ = 0;
     }
     watch();
 }
 
-void LinuxConnection::dropOutput()
 // Descriptors go with the first byte of their frame. When the system has none to spare, because clients do not take
 // theirs, the frame goes without.
 ssize_t LinuxConnection::sendOutput()
@@ -329,16 +329,18 @@ ssize_t LinuxConnection::sendOutput()
     return ::send(socket_.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
 }
 
+void LinuxConnection::dropOutput()
 {
     drop(output_.size() - outputStart_);
     std::string().swap(output_);
     outputStart_ = 0;
-}
     handOver_.reset();
+}
 
 void LinuxConnection::drop(std::size_t bytes)
 {
     unsentBytes_ -= bytes;
+    droppedBytes_ += bytes;
     hub_->counters.droppedBytes += bytes;
 }
 
@@ -361,8 +363,10 @@ void LinuxConnection::watch()
         event.events |= EPOLLOUT;
     if (event.events == watchedEvents_)
         return;
-    if ((watchedEvents_ & ~event.events & EPOLLIN) != 0)
+    if ((watchedEvents_ & ~event.events & EPOLLIN) != 0) {
+        ++readingPauses_;
         ++hub_->counters.readingPauses;
+    }
     watchedEvents_ = event.events;
     event.data.ptr = this;
     ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_MOD, socket_.get(), &event);
@@ -381,24 +385,29 @@ void LinuxConnection::breakOff(std::string reason)
 void LinuxConnection::end(std::optional<std::string> interruptedBecause)
 {
     assert(hub_->isConnectionThread());
+    std::uint64_t readingPauses = 0;
     {
         const foundation::Lock lock(lock_);
         if (isOver_)
             return;
         isOver_ = true;
         dropOutput();
+        readingPauses = readingPauses_;
         if (isResumed_) // closing does not suffice when a child process happens to hold a copy
             ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_DEL, socket_.get(), nullptr);
         socket_ = FileDescriptor();
     }
+    if (hasAskedForTraceMarker_ && hub_->traceAccess != nullptr)
+        hub_->traceAccess->forget(this);
     // The handlers go with the connection: they may hold it.
     callHandler_ = nullptr;
     EndHandler interrupted = std::exchange(interruptionHandler_, nullptr);
     EndHandler invalidated = std::exchange(invalidationHandler_, nullptr);
+    if (readingPauses != 0 || droppedBytes_ != 0)
+        KESTO_LOG(hub_->log, Default, "{} was behind: reading paused {} times, {} bytes of answers were dropped",
+                  description(), readingPauses, droppedBytes_.load());
     if (interruptedBecause) {
         ++hub_->counters.interrupted;
-    if (hasAskedForTraceMarker_ && hub_->traceAccess != nullptr)
-        hub_->traceAccess->forget(this);
         KESTO_LOG(hub_->log, Default, "{} ends: {}", description(), *interruptedBecause);
         if (interrupted)
             interrupted();

@@ -6,7 +6,7 @@
 //
 // Every client is taken for hostile. One that breaks the protocol ends its own connection, with one line in the
 // log. One that asks faster than it is answered, or that does not read its answers, is not read from until it
-// is less behind; one that then still has far too much unread is cut off.
+// is less behind; one that then still has far too much unread is cut off. What that cost is said when it ends.
 #pragma once
 
 #include "foundation/Cbor.h"
@@ -45,6 +45,7 @@ public:
     LinuxConnection(std::shared_ptr<ConnectionHub> hub, FileDescriptor socket, Peer peer);
 
     [[nodiscard]] std::int32_t processIdentifier() const override { return peer_.processIdentifier; }
+    [[nodiscard]] std::uint32_t userIdentifier() const { return peer_.userIdentifier; }
     [[nodiscard]] std::string description() const override;
     void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
@@ -64,11 +65,11 @@ public:
 
 private:
     class Credit;
-
     struct HandOver {
         std::size_t place; // in the output, where the frame begins that they go with
         TraceDescriptors descriptors;
     };
+
     [[nodiscard]] bool isBrokenOff();
     [[nodiscard]] bool settle();
     void read();
@@ -76,17 +77,17 @@ private:
     void takeIn(std::string_view bytes);
     [[nodiscard]] std::expected<void, Violation> decodeFrames();
     [[nodiscard]] std::expected<void, Violation> deliverCalls();
-    void breakOff(std::string reason);
     [[nodiscard]] std::expected<void, Violation> askForTraceMarker(const foundation::Value& call);
     void handOver(std::uint64_t call, const TraceDescriptors& descriptors);
+    void breakOff(std::string reason);
     void end(std::optional<std::string> interruptedBecause);
 
     void returnCredit(std::size_t bytes);
     [[nodiscard]] bool isBehind() const noexcept;
     void drop(std::size_t bytes);
     void writeOutput() KESTO_REQUIRES(lock_);
-    void dropOutput() KESTO_REQUIRES(lock_);
     [[nodiscard]] ssize_t sendOutput() KESTO_REQUIRES(lock_);
+    void dropOutput() KESTO_REQUIRES(lock_);
     void watch() KESTO_REQUIRES(lock_);
 
     const std::shared_ptr<ConnectionHub> hub_;
@@ -98,20 +99,23 @@ private:
     EndHandler invalidationHandler_;
     FrameReader reader_;
     foundation::CborDecoder decoder_;
-
+    bool peerIsDone_ = false; // it closed its side, between two frames
     bool hasAskedForTraceMarker_ = false;
+
     // How far behind the client is.
     std::atomic<std::uint64_t> unanswered_; // calls in the upper half, their bytes in the lower half
     std::atomic<std::size_t> unsentBytes_; // from `send` until the socket took them
+    std::atomic<std::uint64_t> droppedBytes_; // of answers that it will not get
 
     foundation::Mutex lock_;
     FileDescriptor socket_; // read from without the lock, for only the connection thread closes it, under the lock
     std::string output_ KESTO_GUARDED_BY(lock_); // what the socket did not take yet, from `outputStart_` on
     std::size_t outputStart_ KESTO_GUARDED_BY(lock_) = 0;
+    std::optional<HandOver> handOver_ KESTO_GUARDED_BY(lock_);
     std::uint32_t watchedEvents_ KESTO_GUARDED_BY(lock_) = 0;
+    std::uint64_t readingPauses_ KESTO_GUARDED_BY(lock_) = 0;
     std::optional<std::string> breakReason_ KESTO_GUARDED_BY(lock_);
     bool isResumed_ KESTO_GUARDED_BY(lock_) = false;
-    std::optional<HandOver> handOver_ KESTO_GUARDED_BY(lock_);
     bool isOver_ KESTO_GUARDED_BY(lock_) = false;
     bool cannotSend_ KESTO_GUARDED_BY(lock_) = false; // the peer takes nothing any more
 };

@@ -59,7 +59,8 @@ LinuxConnectionListener::LinuxConnectionListener(ListeningSocket socket, FileDes
     : socket_(std::move(socket)),
       wake_(std::move(wake)),
       hub_(std::make_shared<ConnectionHub>(std::move(epoll), log)),
-      mostConnections_(mostConnections())
+      mostConnections_(mostConnections()),
+      mostConnectionsOfAUser_(mostConnections_ - mostConnections_ / partForOthers)
 {
 }
 
@@ -125,7 +126,7 @@ void LinuxConnectionListener::handle(LinuxConnection& connection, std::uint32_t 
 {
     if (connection.handle(events))
         return;
-    connections_.erase(&connection);
+    forget(connection);
     if (!isAccepting_)
         resumeAccepting();
 }
@@ -153,6 +154,15 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     socklen_t size = sizeof peer;
     if (::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0)
         return; // gone already
+    User& user = users_[peer.uid];
+    if (user.connections == mostConnectionsOfAUser_) {
+        ++hub_->counters.refused;
+        if (!std::exchange(user.refusalIsLogged, true))
+            KESTO_LOG(hub_->log, Error, "user {} has {} connections and gets no more until one ends", peer.uid,
+                      user.connections);
+        return;
+    }
+    ++user.connections;
     const auto connection =
         std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid});
     connections_.emplace(connection.get(), connection);
@@ -160,6 +170,15 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     if (!delegate_->shouldAcceptNewConnection(*this, connection))
         connection->invalidate();
     handle(*connection, 0); // in case that it is over already
+}
+
+void LinuxConnectionListener::forget(const LinuxConnection& connection)
+{
+    const auto user = users_.find(connection.userIdentifier());
+    user->second.refusalIsLogged = false;
+    if (--user->second.connections == 0)
+        users_.erase(user);
+    connections_.erase(&connection);
 }
 
 // Without descriptors there is nothing to do about the clients that wait but to let them wait: asking again at

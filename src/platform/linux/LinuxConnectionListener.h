@@ -29,6 +29,9 @@ class LinuxConnectionListener final : public ConnectionListener {
 public:
     // Of the descriptors that the process may have open, those that clients cannot take.
     static constexpr std::size_t descriptorsForTheRest = 64;
+    // Of the connections that are left, the part (a fourth) that no user alone can take: further connections of one
+    // user are closed at once, so that none keeps the others out.
+    static constexpr std::size_t partForOthers = 4;
     // How long clients wait when the system has no descriptor for them.
     static constexpr std::chrono::milliseconds acceptingPause{1000};
 
@@ -37,11 +40,11 @@ public:
     create(ListeningSocket socket, LogCategory& log);
 
     void setDelegate(ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
+    // Who hands out the marker of the kernel's trace to clients that ask. Before `resume`.
+    void setTraceAccess(TraceMarkerAccess& access) { hub_->traceAccess = &access; }
     // Called by `resume` when clients that connect from now on are served. Before `resume`.
     void setListeningHandler(std::move_only_function<void()> handler) { listeningHandler_ = std::move(handler); }
     void resume() override;
-    // Who hands out the marker of the kernel's trace to clients that ask. Before `resume`.
-    void setTraceAccess(TraceMarkerAccess& access) { hub_->traceAccess = &access; }
     // Makes `resume` end all connections and return. Any thread.
     void stop() override;
 
@@ -51,6 +54,12 @@ public:
 private:
     using Clock = std::chrono::steady_clock;
 
+    // A user with connections.
+    struct User {
+        std::size_t connections = 0;
+        bool refusalIsLogged = false; // since one of them ended
+    };
+
     LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake, LogCategory& log);
 
     [[nodiscard]] bool watch(int operation, int descriptor, std::uint32_t events, void* tag);
@@ -59,6 +68,7 @@ private:
     void handle(const epoll_event& event);
     void acceptWaiting();
     void welcome(FileDescriptor socket);
+    void forget(const LinuxConnection& connection);
     void handle(LinuxConnection& connection, std::uint32_t events);
     void pauseAccepting(std::optional<Clock::duration> pause, int error);
     void resumeAccepting();
@@ -67,12 +77,14 @@ private:
     FileDescriptor wake_;
     const std::shared_ptr<ConnectionHub> hub_;
     const std::size_t mostConnections_;
+    const std::size_t mostConnectionsOfAUser_;
     ConnectionListenerDelegate* delegate_ = nullptr;
     std::move_only_function<void()> listeningHandler_;
     std::atomic<bool> isStopping_ = false;
 
     // The connection thread's.
     std::unordered_map<const LinuxConnection*, std::shared_ptr<LinuxConnection>> connections_;
+    std::unordered_map<std::uint32_t, User> users_; // by number
     bool isAccepting_ = false;
     bool pauseIsLogged_ = false;
     std::optional<Clock::time_point> acceptAgainAt_;

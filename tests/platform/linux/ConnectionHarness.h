@@ -125,6 +125,7 @@ public:
 
     void close() { socket_ = platform::FileDescriptor(); }
     void stopWriting() { ::shutdown(socket_.get(), SHUT_WR); }
+    void stopReading() { ::shutdown(socket_.get(), SHUT_RD); }
     [[nodiscard]] int descriptor() const { return socket_.get(); }
 
 private:
@@ -213,9 +214,9 @@ protected:
         ASSERT_TRUE(created) << created.error().message();
         listener = *std::move(created);
         listener->setDelegate(*this);
-        bool isListening = false;
         if (beforeListening)
             beforeListening();
+        bool isListening = false;
         listener->setListeningHandler([&] { progress.change([&] { isListening = true; }); });
         thread = std::thread([this] { listener->resume(); });
         ASSERT_TRUE(progress.waitFor([&] { return isListening; }));
@@ -265,14 +266,9 @@ protected:
         return true;
     }
 
-    // The lines of connections that broke.
-    [[nodiscard]] std::vector<std::string> logged()
-    {
-        std::vector<std::string> lines;
-        for (const LogLine& line : platform.log.lines("kerc"))
-            lines.push_back(line.message);
-        return lines;
-    }
+    // The lines of connections that broke, and those of connections that were behind.
+    [[nodiscard]] std::vector<std::string> logged() { return linesThatAreBehind(false); }
+    [[nodiscard]] std::vector<std::string> loggedBehind() { return linesThatAreBehind(true); }
     [[nodiscard]] static std::string endsBecause(const std::string& reason)
     {
         return "connection of process " + std::to_string(::getpid()) + " (user " + std::to_string(::getuid())
@@ -282,11 +278,11 @@ protected:
     TestPlatform platform;
     TemporaryDirectory directory;
     const std::filesystem::path path = directory.path() / "socket";
-    std::function<void()> beforeListening; // what is to be set on the listener
     Progress progress;
     std::vector<std::shared_ptr<ConnectionRecord>> records;
     bool accepts = true;
     Handler handler; // instead of keeping the call
+    std::function<void()> beforeListening; // what is to be set on the listener
     std::unique_ptr<platform::LinuxConnectionListener> listener;
     std::thread thread;
 
@@ -307,6 +303,15 @@ private:
             record.history.push_back(std::move(event));
             record.threads.push_back(std::this_thread::get_id());
         });
+    }
+
+    std::vector<std::string> linesThatAreBehind(bool wanted)
+    {
+        std::vector<std::string> lines;
+        for (const LogLine& line : platform.log.lines("kerc"))
+            if (line.message.contains(" was behind: ") == wanted)
+                lines.push_back(line.message);
+        return lines;
     }
 
     std::size_t taken = 0;

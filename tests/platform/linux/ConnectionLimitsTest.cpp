@@ -1,6 +1,7 @@
 // Clients that ask for too much or read too little, and too many of them: each limit holds, costs only whoever met
 // it, and is left again.
 #include "platform/linux/ConnectionHarness.h"
+#include "platform/linux/Outbox.h"
 
 #include <atomic>
 #include <gmock/gmock.h>
@@ -95,6 +96,9 @@ TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
     EXPECT_THAT(logged(), ElementsAre(endsBecause("it does not read its answers")));
     EXPECT_GT(listener->counters().droppedBytes, LinuxConnection::mostUnsentBytes);
     EXPECT_LE(listener->counters().droppedBytes, sent);
+    EXPECT_THAT(loggedBehind(),
+                ElementsAre(testing::MatchesRegex("connection of process .* was behind: reading paused "
+                                                  "1 times, [0-9]+ bytes of answers were dropped")));
 
     other.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(otherRecord, {"call 1"}));
@@ -152,6 +156,55 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheUnansweredCallsAreTooMany)
     EXPECT_TRUE(waitForCalls(record, 1));
 }
 
+// A client that takes no answers any more may have much to say still.
+TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAllTheSame)
+{
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    client.write(callNumber(1));
+    ASSERT_TRUE(waitForCalls(record, 1));
+    client.stopReading();
+    record.connection->send(answerTo({1}));
+    client.write(callNumber(2));
+    EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2"}));
+    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({1}).size());
+    client.close();
+    EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2", "invalidated"}));
+}
+
+// Reading stops because of what waits to be sent, and nothing of it is: it must go on when all of that was dropped.
+TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDropped)
+{
+    constexpr std::size_t answerSize = 1000 * 1024;
+    constexpr std::size_t answers = LinuxConnection::manyUnsentBytes / answerSize + 1; // a turn
+    std::vector<WorkItem> letters;
+    LinuxWorkQueues queues;
+    queues.setTurnEndHandler([&] {
+        if (auto send = Outbox::endTurn())
+            progress.change([&] { letters.push_back(std::move(send)); });
+    });
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    {
+        const auto queue = queues.makeSerialQueue("server", QualityOfService::UserInteractive);
+        for (std::size_t turn = 1; turn <= 2; ++turn) {
+            queue->submit([&] {
+                for (std::size_t answer = 0; answer < answers; ++answer)
+                    record.connection->send(answerTo({1}, answerSize));
+            });
+            ASSERT_TRUE(progress.waitFor([&] { return letters.size() == turn; }));
+        }
+    }
+    client.stopReading();
+    for (WorkItem& letter : letters)
+        letter();
+    EXPECT_GT(listener->counters().droppedBytes, 2 * LinuxConnection::manyUnsentBytes);
+    client.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(record, {"call 1"}));
+}
+
 // As do the starts of ten thousand sessions, which are answered when they stop.
 TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
 {
@@ -183,6 +236,8 @@ TEST_F(ConnectionLimits, AClientThatGoesWhileItIsNotReadFromIsNoticed)
     EXPECT_TRUE(waitForEnd(record));
     stop();
     EXPECT_EQ(record.calls.size(), static_cast<std::size_t>(written)) << "what it had written was lost";
+    EXPECT_THAT(loggedBehind(),
+                ElementsAre(testing::EndsWith("was behind: reading paused 1 times, 0 bytes of answers were dropped")));
 }
 
 TEST_F(ConnectionLimits, CreditGivenBackFromManyThreadsIsAllThere)
@@ -281,6 +336,36 @@ TEST_F(Descriptors, ClientsAreAcceptedAfterAPauseWhenDescriptorsWereFreedElsewhe
     waiting.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
     EXPECT_EQ(logged().size(), 1U);
+}
+
+TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
+{
+    constexpr std::size_t most = 8;
+    constexpr std::size_t mostOfOneUser = most - most / LinuxConnectionListener::partForOthers;
+    limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
+    listen();
+    ::setrlimit(RLIMIT_NOFILE, &before);
+    std::vector<std::unique_ptr<Client>> clients;
+    for (std::size_t index = 0; index < mostOfOneUser; ++index) {
+        clients.push_back(std::make_unique<Client>(path));
+        connected();
+    }
+    for (int attempt = 0; attempt < 3; ++attempt)
+        EXPECT_EQ(Client(path).readNumber(), std::nullopt) << "it is closed at once";
+    EXPECT_EQ(listener->counters().refused, 3U);
+    EXPECT_EQ(listener->counters().accepted, mostOfOneUser);
+    EXPECT_THAT(
+        logged(),
+        ElementsAre("user " + std::to_string(::getuid()) + " has 6 connections and gets no more until one ends"));
+
+    const auto last = progress.look([&] { return records.back(); });
+    clients.pop_back();
+    ASSERT_TRUE(waitForEnd(*last));
+    Client again(path);
+    again.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
+    EXPECT_EQ(Client(path).readNumber(), std::nullopt);
+    EXPECT_EQ(logged().size(), 2U) << "and is said again";
 }
 
 TEST_F(Descriptors, SomeAreKeptFromClients)
