@@ -15,6 +15,7 @@ constexpr int exitUsage = 2;
 void requireSubcommand(CLI::App& application);
 
 void addBugsCommand(CLI::App& application, int& exitStatus);
+void addChannelsCommand(CLI::App& application, int& exitStatus);
 void addClientCommand(CLI::App& application, int& exitStatus);
 void addEventsCommand(CLI::App& application, int& exitStatus);
 void addNotifyCommand(CLI::App& application, int& exitStatus);

@@ -22,6 +22,7 @@ int main(int argumentCount, char** arguments)
     requireSubcommand(application);
     int exitStatus = exitOk;
     addBugsCommand(application, exitStatus);
+    addChannelsCommand(application, exitStatus);
     addClientCommand(application, exitStatus);
     addEventsCommand(application, exitStatus);
     addNotifyCommand(application, exitStatus);

@@ -52,7 +52,7 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
 TEST_F(Completion, NamesEveryOptionThatTheToolHas)
 {
     for (const std::string verb :
-         {"client", "events", "summary", "notify", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
+         {"channels", "client", "events", "summary", "notify", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
         std::istringstream help(tool.runShell("$kesto " + verb + " --help").output);
         const auto offered = completions(verb + " --");
         for (std::string word; help >> word;)
