@@ -1,3 +1,5 @@
+// Events are picked here and handed over as one item of the session's queue for each step of the trace; how many are
+// on their way is bounded, since that queue may be slow.
 #include "platform/linux/TraceFanOut.h"
 
 #include <algorithm>

@@ -1,3 +1,5 @@
+// The page is a sealed memory file: the service maps it for writing first, and the seal then forbids that to
+// everybody who comes later. Nobody is answered under the lock.
 #include "platform/linux/TraceMarkerAccess.h"
 
 #include "platform/linux/TraceMarker.h"

@@ -1,3 +1,5 @@
+// Processors are streams that are in order by themselves, so that ordering all of them is merging neighbours: as
+// good as nothing where one processor does all the work.
 #include "platform/linux/TraceMerger.h"
 
 #include "platform/linux/TraceMarker.h"

@@ -1,3 +1,5 @@
+// Every length is held against what is left before it is believed; the first that does not fit ends the page, for
+// nothing behind it can be told apart any more.
 #include "platform/linux/TracePage.h"
 
 namespace platform {

@@ -1,3 +1,5 @@
+// tracefs speaks text, and what it says differs between kernels: what this service relies on is read and compared
+// before the first event, rather than found out from events that make no sense.
 #include "platform/linux/TracefsInstance.h"
 
 #include "platform/linux/FilesAt.h"

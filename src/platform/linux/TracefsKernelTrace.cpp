@@ -1,3 +1,5 @@
+// Sessions come and go on any thread, the reading thread looks at the buffers: one lock holds them apart, and events
+// are handed to the sessions' own queues.
 #include "platform/linux/TracefsKernelTrace.h"
 
 #include "platform/linux/SystemErrorText.h"

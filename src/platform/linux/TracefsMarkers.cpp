@@ -1,3 +1,4 @@
+// One write, whose failure nobody could do anything about: an event that is not taken is one that was not seen.
 #include "platform/linux/TracefsMarkers.h"
 
 #include "platform/linux/TraceMarker.h"
