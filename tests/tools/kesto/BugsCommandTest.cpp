@@ -1,4 +1,5 @@
 // Captured bugs from a shell: what the service's folder holds, as a table, as JSON, and one as a whole.
+#include "end_to_end/Kestod.h"
 #include "platform/linux/BugCaptureFolder.h"
 #include "support/ParseJson.h"
 #include "tools/kesto/Tool.h"
@@ -158,6 +159,23 @@ TEST_F(BugsCommand, ReadsTheDirectoryThatItIsTold)
     capture("player");
     fs::rename(captures, directory.path() / "elsewhere");
     EXPECT_THAT(tool.print({"bugs", "--directory", directory.path() / "elsewhere"}), HasSubstr("player"));
+}
+
+TEST_F(BugsCommand, ShowsWhatARealServiceCaptured)
+{
+    end_to_end::Kestod kestod({{"device.toml", "InternalBuild = true"}}, {{"KESTO_LOG", "default,kerb=info"}});
+    kestod.start();
+    Tool beside{kestod.directory()};
+    const std::string report = R"(["send", {"Haptic_Active_Hardware_Time_Seconds": )";
+    static_cast<void>(beside.print({"client", "--socket", kestod.socketPath()},
+                                   "[\"create\", 42]\n[\"setServiceType\", \"haptics\", 42]\n" + report
+                                       + "1}, \"DSP_Playback\", \"Gimbo\", [42]]\n" + report
+                                       + "2}, \"DSP_Playback\", \"Gimbo\", [42]]\n"));
+    ASSERT_TRUE(kestod.waitForLog("Response from ulmetReporter"));
+    EXPECT_THAT(beside.print({"bugs"}), HasSubstr(" KiB kesto            haptics DSP_Playback Gimbo\n"));
+    EXPECT_THAT(beside.print({"bugs", "1"}),
+                AllOf(HasSubstr("  success: true\n"), HasSubstr("Incrementing Vorp counter. kesto\n"),
+                      HasSubstr("    reporterID: 42\n"), HasSubstr("    service: haptics\n")));
 }
 
 TEST_F(BugsCommand, SaysWhatIsNotThere)
