@@ -6,6 +6,7 @@
 
 #include <future>
 #include <gtest/gtest.h>
+#include <optional>
 
 namespace platform {
 namespace {
@@ -68,6 +69,20 @@ TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)
     turnEnded.get_future().wait();
     providers.analyticsStore().flush();
     EXPECT_EQ(support::StoreReader(directory.path() / "state" / "analytics.sqlite3").eventCount(), 1);
+}
+
+TEST_F(LinuxPlatformTest, ASnapshotThatWasAskedForIsTakenBeforeThePlatformEnds)
+{
+    std::optional<foundation::Dictionary> response;
+    {
+        LinuxPlatform providers(launch());
+        const auto reporter = providers.platform().bugCapture.makeReporter();
+        reporter->requestSnapshot(reporter->makeSignature("domain", "type", "", "", "", std::nullopt), 0, std::nullopt,
+                                  std::nullopt, [&](foundation::Dictionary given) { response = std::move(given); });
+    }
+    ASSERT_TRUE(response);
+    EXPECT_TRUE(response->find("success")->asBoolean()) << foundation::Value(*response).text();
+    EXPECT_TRUE(fs::exists(fs::path(response->find("directory")->stringView()) / "signature.json"));
 }
 
 TEST_F(LinuxPlatformTest, WhatWasSentIsKeptWhenThePlatformEnds)
