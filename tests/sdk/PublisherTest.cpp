@@ -491,6 +491,17 @@ TEST_F(RarePublisherTest, WritesAFileNoMoreOftenThanItIsTold)
     EXPECT_EQ(value(), 10'000);
 }
 
+TEST_F(RarePublisherTest, EndsAtOnceThoughItsThreadRests)
+{
+    kesto::SimpleChannel channel;
+    ASSERT_EQ(channel.create(publisher, {"amp", "Tx", "", "a"}), Status::Ok);
+    channel.add(1);
+    ASSERT_TRUE(waitForValue(1)) << "from here on it rests for an hour";
+    channel.destroy();
+    publisher = kesto::Publisher();
+    EXPECT_THAT(namesIn(root), IsEmpty());
+}
+
 class FreshPublisherTest : public PublisherTest {
 protected:
     FreshPublisherTest() : PublisherTest({"", milliseconds(1), milliseconds(1)}) { }
