@@ -52,7 +52,7 @@ void Kestod::start(const InheritedDescriptors& inherited)
     std::vector<std::string> variables;
     for (const auto& [name, value] : environment_)
         if (!value.empty())
-            variables.push_back(name + "=" + value);
+            variables.push_back(std::string(name).append("=").append(value));
     for (const char* name : {"ASAN_OPTIONS", "TSAN_OPTIONS", "UBSAN_OPTIONS", "LSAN_OPTIONS", "LD_LIBRARY_PATH"})
         if (const char* value = std::getenv(name))
             variables.push_back(std::string(name) + "=" + value);
@@ -61,6 +61,7 @@ void Kestod::start(const InheritedDescriptors& inherited)
         variables.push_back(std::string(passedTo).append(longestPID, '\0')); // only the process knows its own
     }
     std::vector<char*> pointers;
+    pointers.reserve(variables.size() + 1);
     for (std::string& variable : variables)
         pointers.push_back(variable.data());
     pointers.push_back(nullptr);
@@ -68,9 +69,11 @@ void Kestod::start(const InheritedDescriptors& inherited)
     const fs::path logPath = directory() / "log";
     process_ = ::fork();
     if (process_ == 0) {
-        const bool hasLogFile = inherited.standardError < 0;
-        ::dup2(hasLogFile ? ::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600) : inherited.standardError,
-               STDERR_FILENO);
+        const int standardError = inherited.standardError >= 0
+            ? inherited.standardError
+            : ::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);
+        if (standardError < 0 || ::dup2(standardError, STDERR_FILENO) < 0)
+            ::_exit(127);
         if (inherited.listeningSocket >= 0) {
             if (::dup2(inherited.listeningSocket, firstPassedDescriptor) == inherited.listeningSocket)
                 ::fcntl(firstPassedDescriptor, F_SETFD, 0);

@@ -2,11 +2,13 @@
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 
+#include <cerrno>
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <system_error>
 #include <unistd.h>
 
 namespace end_to_end {
@@ -23,7 +25,8 @@ platform::FileDescriptor socketBoundTo(const std::string& path, int type)
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
     path.copy(address.sun_path, sizeof address.sun_path - 1);
-    EXPECT_EQ(::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+    if (!socket || ::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0)
+        throw std::system_error(errno, std::generic_category(), path);
     return socket;
 }
 
