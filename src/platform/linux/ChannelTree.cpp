@@ -26,16 +26,18 @@ struct CloseFolder {
 };
 using Folder = std::unique_ptr<DIR, CloseFolder>;
 
-// Null, with `errno`, when it cannot be opened. Below the root no link is followed.
-Folder openFolder(int parent, const char* name, int linkFlag)
+// Or the `errno` of why it cannot be opened. Below the root no link is followed.
+std::expected<Folder, int> openFolder(int parent, const char* name, int linkFlag)
 {
     const int descriptor = ::openat(parent, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC | linkFlag);
     if (descriptor < 0)
-        return nullptr;
+        return std::unexpected(errno);
     Folder folder(::fdopendir(descriptor));
-    if (!folder)
-        ::close(descriptor);
-    return folder;
+    if (folder)
+        return folder;
+    const int error = errno;
+    ::close(descriptor);
+    return std::unexpected(error);
 }
 
 struct Entry {
@@ -102,10 +104,10 @@ private:
 
     void descend(int parent, std::size_t level)
     {
-        if (const Folder folder = openFolder(parent, names_[level].c_str(), O_NOFOLLOW))
-            readFolder(folder.get(), level + 1);
-        else if (errno != ENOENT)
-            fail(systemErrorText(errno), level);
+        if (const auto folder = openFolder(parent, names_[level].c_str(), O_NOFOLLOW))
+            readFolder(folder->get(), level + 1);
+        else if (folder.error() != ENOENT)
+            fail(systemErrorText(folder.error()), level);
     }
 
     void readChannel(int folder, unsigned char type)
@@ -179,13 +181,13 @@ private:
 
 std::expected<ChannelReading, std::error_code> ChannelTree::read(const ChannelSelection& selection) const
 {
-    const Folder folder = openFolder(AT_FDCWD, root_.c_str(), 0);
-    if (!folder && errno == ENOENT)
+    const auto folder = openFolder(AT_FDCWD, root_.c_str(), 0);
+    if (!folder && folder.error() == ENOENT)
         return ChannelReading();
     if (!folder)
-        return std::unexpected(std::error_code(errno, std::generic_category()));
+        return std::unexpected(std::error_code(folder.error(), std::generic_category()));
     Reader reader(selection, limits_);
-    reader.readFolder(folder.get(), 0);
+    reader.readFolder(folder->get(), 0);
     return std::move(reader).take();
 }
 
