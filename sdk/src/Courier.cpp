@@ -11,6 +11,7 @@ namespace libkesto {
 namespace {
 
 constexpr Courier::Milliseconds forever{-1}; // as poll has it
+constexpr std::uint64_t traceRequest = 0; // its number; those of calls begin with 1
 
 } // namespace
 
@@ -45,7 +46,7 @@ void Courier::run() noexcept
             disconnect({KESTO_OUT_OF_MEMORY});
         }
     }
-    connection_.close();
+    close();
     state_.store(KESTO_STATE_CLOSED);
     calls_.endAll(KESTO_CLOSED);
     loseWaitingCalls(KESTO_CLOSED);
@@ -68,12 +69,21 @@ void Courier::connect()
         return disconnect(opened.error());
     ++counters_.connections;
     retryPause_ = settings_.firstRetry;
+    if (settings_.tracer)
+        connection_.appendTraceRequest(traceRequest);
     changeState(KESTO_STATE_CONNECTED);
+}
+
+void Courier::close() noexcept
+{
+    connection_.close();
+    if (settings_.tracer)
+        settings_.tracer->detach(); // whatever a service said that is gone
 }
 
 void Courier::disconnect(ConnectionFailure failure)
 {
-    connection_.close();
+    close();
     retryAt_.reset();
     if (settings_.reconnect) {
         retryAt_ = Clock::now() + retryPause_;
@@ -114,8 +124,16 @@ std::expected<std::size_t, ConnectionFailure> Courier::receive()
 {
     return connection_.receive([this](std::string_view frame) {
         const auto answer = readAnswer(frame, decoder_);
-        return answer && calls_.answer(*answer);
+        return answer && take(*answer);
     });
+}
+
+bool Courier::take(const AnswerFrame& answer)
+{
+    if (answer.call != traceRequest || !settings_.tracer)
+        return calls_.answer(answer);
+    TraceDescriptors descriptors = connection_.takeDescriptors();
+    return !descriptors[0] || settings_.tracer->attach(std::move(descriptors)); // without any, nobody is to trace
 }
 
 bool Courier::canTakeCalls() const noexcept

@@ -43,6 +43,8 @@ public:
     // Any thread.
     void stop() noexcept;
     [[nodiscard]] kesto_state state() const noexcept { return state_.load(); }
+    // Any thread.
+    [[nodiscard]] const Tracer* tracer() const noexcept { return settings_.tracer.get(); }
 
     // Whether the caller is being told of a change of state. What it gives then, on the client's thread, goes ahead of
     // what waits in the mailbox: a message that was sent while the connection was made finds the sessions that are made
@@ -57,8 +59,10 @@ private:
     void connect();
     void exchange();
     [[nodiscard]] std::expected<std::size_t, ConnectionFailure> receive();
+    [[nodiscard]] bool take(const AnswerFrame& answer);
     void pauseBeforeRetry();
     void disconnect(ConnectionFailure failure);
+    void close() noexcept;
 
     [[nodiscard]] bool canTakeCalls() const noexcept;
     void takeCalls();

@@ -1,5 +1,6 @@
 #include "ServiceConnection.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 #include <sys/socket.h>
@@ -57,6 +58,8 @@ void ServiceConnection::close() noexcept
     outbox_.clear();
     sentBytes_ = 0;
     messageEnds_.clear();
+    descriptors_ = {};
+    expectsDescriptors_ = false;
 }
 
 void ServiceConnection::append(std::uint64_t number, const Call& call)
@@ -69,6 +72,12 @@ void ServiceConnection::append(std::uint64_t number, const Call& call)
     appendCall(number, call, outbox_);
     if (call.head.operation == KESTO_OPERATION_SEND)
         messageEnds_.push_back(streamPosition_ + outbox_.size());
+}
+
+void ServiceConnection::appendTraceRequest(std::uint64_t number)
+{
+    libkesto::appendTraceRequest(number, outbox_);
+    expectsDescriptors_ = true;
 }
 
 ServiceConnection::Result ServiceConnection::send()
@@ -97,9 +106,37 @@ void ServiceConnection::countSentMessages()
     }
 }
 
+// Descriptors come ahead of the frame that they belong to, and go unnoticed where none are expected.
+ssize_t ServiceConnection::receiveBytes()
+{
+    if (!expectsDescriptors_)
+        return ::recv(socket_.get(), received_.data(), received_.size(), MSG_DONTWAIT);
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int) * std::tuple_size_v<TraceDescriptors>)> control;
+    iovec part = {received_.data(), received_.size()};
+    msghdr message{};
+    message.msg_iov = &part;
+    message.msg_iovlen = 1;
+    message.msg_control = control.data();
+    message.msg_controllen = control.size();
+    const ssize_t count = ::recvmsg(socket_.get(), &message, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
+    if (count > 0)
+        keepDescriptors(message);
+    return count;
+}
+
+void ServiceConnection::keepDescriptors(const msghdr& message) noexcept
+{
+    const cmsghdr* const head = CMSG_FIRSTHDR(&message);
+    if (head == nullptr || head->cmsg_level != SOL_SOCKET || head->cmsg_type != SCM_RIGHTS)
+        return;
+    std::array<int, std::tuple_size_v<TraceDescriptors>> numbers{-1, -1};
+    std::memcpy(numbers.data(), CMSG_DATA(head), std::min(head->cmsg_len - CMSG_LEN(0), sizeof numbers));
+    std::ranges::transform(numbers, descriptors_.begin(), [](int number) { return platform::FileDescriptor(number); });
+}
+
 std::expected<std::size_t, ConnectionFailure> ServiceConnection::receive(const FrameHandler& handle)
 {
-    const ssize_t count = ::recv(socket_.get(), received_.data(), received_.size(), MSG_DONTWAIT);
+    const ssize_t count = receiveBytes();
     if (count < 0 && errno == EAGAIN)
         return 0;
     if (count <= 0)

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "Counters.h"
+#include "Tracer.h"
 #include "Wire.h"
 #include "platform/linux/FileDescriptor.h"
 #include "platform/linux/FrameReader.h"
@@ -13,6 +14,8 @@
 #include <functional>
 #include <string>
 #include <string_view>
+#include <sys/socket.h>
+#include <utility>
 #include <vector>
 
 namespace libkesto {
@@ -43,6 +46,10 @@ public:
 
     // Puts a call behind those to be sent.
     void append(std::uint64_t number, const Call& call);
+    // The same with a request for what it takes to emit trace events; the answer's descriptors are then to be taken.
+    void appendTraceRequest(std::uint64_t number);
+    // Those that came last; none of them may be open.
+    [[nodiscard]] TraceDescriptors takeDescriptors() noexcept { return std::exchange(descriptors_, {}); }
     [[nodiscard]] std::size_t unsentBytes() const noexcept { return outbox_.size() - sentBytes_; }
 
     // Sends as much as the socket takes.
@@ -52,6 +59,8 @@ public:
 
 private:
     [[nodiscard]] Result connect(const std::string& path);
+    [[nodiscard]] ssize_t receiveBytes();
+    void keepDescriptors(const msghdr& message) noexcept;
     void countSentMessages();
 
     platform::FileDescriptor socket_;
@@ -62,6 +71,8 @@ private:
     std::uint64_t streamPosition_ = 0; // of the outbox's beginning
     platform::FrameReader reader_;
     std::array<char, 16 * 1024> received_;
+    TraceDescriptors descriptors_;
+    bool expectsDescriptors_ = false;
     Counters& counters_;
 };
 

@@ -1,10 +1,12 @@
 // A client's options with their defaults filled in.
 #pragma once
 
+#include "Tracer.h"
 #include "kesto/kesto.h"
 
 #include <chrono>
 #include <cstddef>
+#include <memory>
 #include <string>
 #include <utility>
 #include <vector>
@@ -54,6 +56,7 @@ struct Settings {
     std::chrono::milliseconds firstRetry;
     std::chrono::milliseconds longestRetry;
     StateListener stateChanged;
+    std::unique_ptr<Tracer> tracer; // null: the client emits no trace events
 };
 
 } // namespace libkesto

@@ -138,6 +138,15 @@ void appendCall(std::uint64_t number, const Call& call, std::string& out)
     platform::appendFrame(frame, out);
 }
 
+void appendTraceRequest(std::uint64_t number, std::string& out)
+{
+    std::string frame;
+    foundation::appendCborArrayHead(2, frame);
+    foundation::appendCborInteger(number, frame);
+    foundation::appendCborText("trace", frame);
+    platform::appendFrame(frame, out);
+}
+
 std::optional<AnswerFrame> readAnswer(std::string_view frame, foundation::CborDecoder& decoder)
 {
     constexpr std::size_t headCount = 2; // the call's number and the error

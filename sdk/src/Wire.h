@@ -52,6 +52,9 @@ void readCall(std::string_view record, Call& call);
 // Appends the call as a frame.
 void appendCall(std::uint64_t number, const Call& call, std::string& out);
 
+// Appends a request for what it takes to emit trace events, as a frame.
+void appendTraceRequest(std::uint64_t number, std::string& out);
+
 // An answer as it came. What its values mean depends on what was asked.
 struct AnswerFrame {
     std::uint64_t call = 0;

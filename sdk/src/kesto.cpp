@@ -68,7 +68,7 @@ kesto_options completed(const kesto_options* given) noexcept
 }
 
 libkesto::Settings settings(const kesto_options& options, std::vector<std::string> paths,
-                            libkesto::StateListener listener)
+                            libkesto::StateListener listener, std::unique_ptr<libkesto::Tracer> tracer)
 {
     const std::size_t queueBytes =
         std::clamp(orDefault(options.queue_bytes, defaultQueueBytes), leastQueueBytes, mostQueueBytes);
@@ -81,7 +81,8 @@ libkesto::Settings settings(const kesto_options& options, std::vector<std::strin
             .firstRetry = firstRetry,
             .longestRetry =
                 std::max(firstRetry, milliseconds(orDefault(options.longest_retry_ms, defaultLongestRetry))),
-            .stateChanged = std::move(listener)};
+            .stateChanged = std::move(listener),
+            .tracer = std::move(tracer)};
 }
 
 // ---- Operations ----
@@ -247,7 +248,10 @@ try {
     auto paths = libkesto::servicePaths(textOrEmpty(options.socket_path), textOrEmpty(options.service_name));
     if (!paths)
         return paths.error();
-    auto made = kesto_client::create(settings(options, *std::move(paths), std::move(listener)));
+    std::unique_ptr<libkesto::Tracer> tracer;
+    if (options.trace && (tracer = libkesto::Tracer::create()) == nullptr)
+        return KESTO_SYSTEM_ERROR;
+    auto made = kesto_client::create(settings(options, *std::move(paths), std::move(listener), std::move(tracer)));
     if (made == nullptr)
         return KESTO_SYSTEM_ERROR;
     *client = made.get(); // before the first callback, which may want to use it

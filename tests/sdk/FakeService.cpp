@@ -8,6 +8,7 @@
 #include <sys/socket.h>
 #include <sys/un.h>
 #include <unistd.h>
+#include <utility>
 
 namespace sdk_test {
 
@@ -34,11 +35,32 @@ void Peer::sendFrame(std::string_view frame)
 void Peer::sendBytes(std::string_view bytes)
 {
     while (!bytes.empty()) {
-        const ssize_t sent = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+        const ssize_t sent = attached_.empty() ? ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL)
+                                               : sendWithDescriptors(bytes);
         if (sent <= 0)
             return;
         bytes.remove_prefix(static_cast<std::size_t>(sent));
     }
+}
+
+ssize_t Peer::sendWithDescriptors(std::string_view bytes)
+{
+    constexpr std::size_t most = 16;
+    const std::vector<int> numbers = std::exchange(attached_, {});
+    const std::size_t size = numbers.size() * sizeof(int);
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(most * sizeof(int))> control{};
+    iovec part = {const_cast<char*>(bytes.data()), bytes.size()};
+    msghdr message = {};
+    message.msg_iov = &part;
+    message.msg_iovlen = 1;
+    message.msg_control = control.data();
+    message.msg_controllen = CMSG_SPACE(size);
+    cmsghdr* const head = CMSG_FIRSTHDR(&message);
+    head->cmsg_level = SOL_SOCKET;
+    head->cmsg_type = SCM_RIGHTS;
+    head->cmsg_len = CMSG_LEN(size);
+    std::memcpy(CMSG_DATA(head), numbers.data(), size);
+    return ::sendmsg(socket_.get(), &message, MSG_NOSIGNAL);
 }
 
 void answerObediently(Peer& peer, const Array& call)

@@ -31,6 +31,8 @@ public:
     void answer(std::uint64_t call, std::vector<foundation::Value> values, foundation::Value error = {});
     void sendFrame(std::string_view frame);
     void sendBytes(std::string_view bytes);
+    // Has the next frame bring descriptors along, which stay the caller's.
+    void attach(std::vector<int> descriptors) { attached_ = std::move(descriptors); }
     // Ends the connection after the current call.
     void close() { isOver_ = true; }
 
@@ -39,7 +41,9 @@ public:
 
 private:
     friend class FakeService;
+    [[nodiscard]] ssize_t sendWithDescriptors(std::string_view bytes);
     platform::FileDescriptor socket_;
+    std::vector<int> attached_;
     platform::FrameReader reader_;
     foundation::CborDecoder decoder_;
     bool isOver_ = false;

@@ -301,6 +301,8 @@ typedef struct kesto_options {
     kesto_state_callback state_changed;
     void* state_user;
     kesto_release_callback state_release;
+    // Whether to ask the service for what it takes to emit trace events: see trace.h.
+    bool trace;
 } kesto_options;
 
 // Makes a client, whose thread at once begins to connect; calls may be made right away and wait for the connection.

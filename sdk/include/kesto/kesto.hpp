@@ -383,6 +383,7 @@ struct Options {
     std::chrono::milliseconds firstRetry{0}; // 0: 100 ms
     std::chrono::milliseconds longestRetry{0}; // 0: 10 s
     StateCallback stateChanged;
+    bool trace = false; // true: events can be emitted into the kernel's trace; see trace.hpp
 };
 
 // One connection to the service. Any thread; but opening, moving and destroying are done while nobody else
@@ -414,6 +415,7 @@ public:
         given.reconnect = options.reconnect;
         given.first_retry_ms = milliseconds(options.firstRetry);
         given.longest_retry_ms = milliseconds(options.longestRetry);
+        given.trace = options.trace;
         if (options.stateChanged) {
             given.state_changed = callState;
             given.state_user = new StateCallback(options.stateChanged);

@@ -1,0 +1,78 @@
+#include "Tracer.h"
+
+#include "platform/linux/TraceMarker.h"
+
+#include <cerrno>
+#include <fcntl.h>
+#include <sys/mman.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace libkesto {
+namespace {
+
+using platform::FileDescriptor;
+using platform::TraceMarkerPage;
+using platform::TraceMarkerRecord;
+
+// Whether it is of the right size and stays so: reading from a page that is gone from its file kills the program.
+bool isPage(const FileDescriptor& file) noexcept
+{
+    struct stat status = {};
+    const int seals = ::fcntl(file.get(), F_GET_SEALS);
+    return ::fstat(file.get(), &status) == 0 && status.st_size >= static_cast<off_t>(TraceMarkerPage::size)
+        && seals >= 0 && (seals & F_SEAL_SHRINK) != 0;
+}
+
+} // namespace
+
+std::unique_ptr<Tracer> Tracer::create()
+{
+    std::unique_ptr<Tracer> tracer(new Tracer);
+    tracer->nowhere_ = FileDescriptor(::open("/", O_PATH | O_CLOEXEC));
+    if (!tracer->nowhere_ || !tracer->mapEmptyPage(0))
+        return nullptr;
+    tracer->marker_ = FileDescriptor(::fcntl(tracer->nowhere_.get(), F_DUPFD_CLOEXEC, 0));
+    return tracer->marker_ ? std::move(tracer) : nullptr;
+}
+
+Tracer::~Tracer()
+{
+    if (page_ != nullptr)
+        ::munmap(page_, TraceMarkerPage::size);
+}
+
+bool Tracer::mapEmptyPage(int flags) noexcept
+{
+    void* const page = ::mmap(page_, TraceMarkerPage::size, PROT_READ, MAP_PRIVATE | MAP_ANONYMOUS | flags, -1, 0);
+    if (page == MAP_FAILED)
+        return false;
+    page_ = page;
+    is_tracing = &static_cast<const TraceMarkerPage*>(page)->isTracing;
+    return true;
+}
+
+void Tracer::emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) const noexcept
+{
+    const int before = errno;
+    const TraceMarkerRecord record{.code = code, .arguments = arguments};
+    [[maybe_unused]] const ssize_t written = ::write(marker_.get(), &record, sizeof record);
+    errno = before;
+}
+
+// The marker first: events are only emitted once the page says so.
+bool Tracer::attach(TraceDescriptors descriptors) noexcept
+{
+    const auto& [marker, page] = descriptors;
+    return marker && isPage(page) && ::dup3(marker.get(), marker_.get(), O_CLOEXEC) >= 0
+        && ::mmap(page_, TraceMarkerPage::size, PROT_READ, MAP_SHARED | MAP_FIXED, page.get(), 0) != MAP_FAILED;
+}
+
+// Neither can fail for what is there already: no new descriptor, no new range of addresses.
+void Tracer::detach() noexcept
+{
+    static_cast<void>(mapEmptyPage(MAP_FIXED));
+    static_cast<void>(::dup3(nowhere_.get(), marker_.get(), O_CLOEXEC));
+}
+
+} // namespace libkesto
