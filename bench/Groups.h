@@ -20,5 +20,6 @@ void measureChannels(const Options& options, Report& report);
 void measureDecoding(const Options& options, Report& report);
 void measureRecord(const Options& options, Report& report);
 void measureTrace(const Options& options, Report& report);
+void measureTracing(const Options& options, Report& report);
 
 } // namespace bench

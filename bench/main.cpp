@@ -35,6 +35,7 @@ constexpr std::array groups{
     Group{"decoding", "CBOR, and keeping a payload", measureDecoding},
     Group{"record", "the diagnostics record to bytes and back", measureRecord},
     Group{"trace", "pairing the events of a trace, and its stop", measureTrace},
+    Group{"tracing", "emitting trace events, and taking the kernel's pages apart", measureTracing},
 };
 
 void printHelp()
