@@ -70,6 +70,7 @@ TEST_F(ConnectionTest, IsRegisteredOnTheServerQueue)
     EXPECT_EQ(clients()[0]->processIdentifier(), pid);
     EXPECT_EQ(clients()[0]->clientStartDate(), startDate);
     EXPECT_EQ(clients()[0]->clientProcessName(), "player");
+    EXPECT_THAT(platform.processTable.forgotten(), ElementsAre(pid)) << "the name is that of now, since it is kept";
 }
 
 TEST_F(ConnectionTest, IsRegisteredBeforeItsFirstCallIsServed)

@@ -11,6 +11,7 @@
 #include <set>
 #include <string>
 #include <utility>
+#include <vector>
 
 namespace support {
 
@@ -74,6 +75,8 @@ public:
         names_.insert_or_assign(processIdentifier, std::move(commandName));
     }
     void remove(std::int32_t processIdentifier) { names_.erase(processIdentifier); }
+    // The processes whose names were not to be believed any more, in order.
+    [[nodiscard]] const std::vector<std::int32_t>& forgotten() const { return forgotten_; }
 
     [[nodiscard]] std::int32_t ownProcessIdentifier() const override { return ownPID; }
     [[nodiscard]] std::string ownProcessName() const override { return "kestod"; }
@@ -84,9 +87,11 @@ public:
             return std::nullopt;
         return platform::ProcessTableEntry{processIdentifier, found->second};
     }
+    void forget(std::int32_t processIdentifier) override { forgotten_.push_back(processIdentifier); }
 
 private:
     std::map<std::int32_t, std::string> names_;
+    std::vector<std::int32_t> forgotten_;
 };
 
 } // namespace support
