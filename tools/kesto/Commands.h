@@ -21,3 +21,4 @@ void addEventsCommand(CLI::App& application, int& exitStatus);
 void addNotifyCommand(CLI::App& application, int& exitStatus);
 void addPrefsCommand(CLI::App& application, int& exitStatus);
 void addSummaryCommand(CLI::App& application, int& exitStatus);
+void addTraceCommand(CLI::App& application, int& exitStatus);

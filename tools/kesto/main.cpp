@@ -28,6 +28,7 @@ int main(int argumentCount, char** arguments)
     addNotifyCommand(application, exitStatus);
     addPrefsCommand(application, exitStatus);
     addSummaryCommand(application, exitStatus);
+    addTraceCommand(application, exitStatus);
     try {
         application.parse(argumentCount, arguments);
         if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0)
