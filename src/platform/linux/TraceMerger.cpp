@@ -65,7 +65,6 @@ void TraceMerger::add(std::vector<KernelTraceEvent>& stream, std::uint32_t cpu, 
     event.arguments = marker.arguments;
 }
 
-// Merges neighbours until one run is left.
 std::span<const KernelTraceEvent> TraceMerger::eventsUpTo(std::uint64_t time)
 {
     doneUpTo_ = std::max(doneUpTo_, time);
@@ -80,17 +79,27 @@ std::span<const KernelTraceEvent> TraceMerger::eventsUpTo(std::uint64_t time)
         runs_.push_back(merged_.size());
     }
     waiting_ -= merged_.size();
-    while (runs_.size() > 2) {
-        std::size_t kept = 1;
-        for (std::size_t run = 0; run + 1 < runs_.size(); run += 2) {
-            const std::size_t end = runs_[std::min(run + 2, runs_.size() - 1)];
-            const auto place = [&](std::size_t index) { return merged_.begin() + static_cast<std::ptrdiff_t>(index); };
-            std::inplace_merge(place(runs_[run]), place(runs_[run + 1]), place(end), isBefore);
-            runs_[kept++] = end;
-        }
-        runs_.resize(kept);
-    }
+    while (runs_.size() > 2)
+        mergeNeighbours();
     return merged_;
+}
+
+// Half as many runs; one without a neighbour stays as it is.
+void TraceMerger::mergeNeighbours()
+{
+    merging_.resize(merged_.size());
+    const auto at = [](auto& events, std::size_t index) { return events.begin() + static_cast<std::ptrdiff_t>(index); };
+    std::size_t kept = 1;
+    for (std::size_t run = 0; run + 1 < runs_.size(); run += 2) {
+        const std::size_t begin = runs_[run];
+        const std::size_t middle = runs_[run + 1];
+        const std::size_t end = runs_[std::min(run + 2, runs_.size() - 1)];
+        std::merge(at(merged_, begin), at(merged_, middle), at(merged_, middle), at(merged_, end), at(merging_, begin),
+                   isBefore);
+        runs_[kept++] = end;
+    }
+    runs_.resize(kept);
+    merged_.swap(merging_);
 }
 
 std::uint64_t TraceMerger::takeLosses() noexcept

@@ -39,12 +39,14 @@ public:
 
 private:
     [[nodiscard]] bool isMarker(std::span<const std::byte> record) const noexcept;
+    void mergeNeighbours();
     void add(std::vector<KernelTraceEvent>& stream, std::uint32_t cpu, const TraceRecord& record);
 
     const TracePageFormat format_;
     const std::uint16_t recordType_;
     std::vector<std::vector<KernelTraceEvent>> streams_; // one a processor, each in the order of time
     std::vector<KernelTraceEvent> merged_;
+    std::vector<KernelTraceEvent> merging_; // what becomes of it
     std::vector<std::size_t> runs_; // where the parts of `merged_` begin that are in order, and its end
     std::size_t waiting_ = 0;
     std::uint64_t doneUpTo_ = 0;

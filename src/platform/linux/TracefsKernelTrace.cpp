@@ -133,7 +133,6 @@ bool TracefsKernelTrace::setUp()
     }
     problem_.clear();
     instance_ = *std::move(opened);
-    merger_.emplace(instance_->pageFormat(), instance_->markerType());
     if (const auto error = access_.open(instance_->marker()); error)
         log_.error("clients cannot emit trace events: {}", systemErrorText(error.value()));
     return true;
@@ -162,6 +161,7 @@ int TracefsKernelTrace::switchOn()
     if (const auto error = instance_->switchOn(); error)
         return error.value();
     isOn_ = true;
+    merger_.emplace(instance_->pageFormat(), instance_->markerType());
     lastReading_ = Clock::now();
     if (thread_.joinable())
         return 0;
@@ -177,6 +177,7 @@ int TracefsKernelTrace::switchOn()
 void TracefsKernelTrace::switchOff()
 {
     isOn_ = false;
+    merger_.reset(); // and all memory that it took
     instance_->switchOff();
     tellEmitters();
 }

@@ -79,7 +79,7 @@ private:
     foundation::Condition changed_;
     std::string problem_ KESTO_GUARDED_BY(lock_); // that was told
     std::optional<TracefsInstance> instance_ KESTO_GUARDED_BY(lock_);
-    std::optional<TraceMerger> merger_ KESTO_GUARDED_BY(lock_);
+    std::optional<TraceMerger> merger_ KESTO_GUARDED_BY(lock_); // while it is on
     TraceFanOut fanOut_ KESTO_GUARDED_BY(lock_);
     Clock::time_point lastReading_ KESTO_GUARDED_BY(lock_);
     bool isOn_ KESTO_GUARDED_BY(lock_) = false;

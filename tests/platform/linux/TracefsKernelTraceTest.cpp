@@ -290,7 +290,8 @@ TEST_F(TracefsKernelTraceTest, SaysWhatIsForbidden)
 {
     constexpr uid_t nobody = 65534;
     const bool isRoot = ::geteuid() == 0;
-    fs::permissions(tree.directory.path(), fs::perms::others_exec, fs::perm_options::add);
+    for (const fs::path& path : {tree.directory.path(), tree.directory.path() / "tracing", tree.mounts})
+        fs::permissions(path, fs::perms(0055), fs::perm_options::add);
     fs::permissions(tree.instance.parent_path(), fs::perms::none);
     ASSERT_TRUE(!isRoot || ::seteuid(nobody) == 0); // nothing is forbidden to root
     const auto session = trace.createTraceSession();
