@@ -1,3 +1,5 @@
+// Room is claimed at one end and given back at the other, both as numbers that only grow; where a record would cross
+// the end of the ring, a filler takes its place.
 #include "CallQueue.h"
 
 #include <bit>

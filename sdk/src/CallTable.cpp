@@ -1,3 +1,4 @@
+// What is said of a call goes by what a session's state allows: the table follows it as the service does.
 #include "CallTable.h"
 
 #include <string>

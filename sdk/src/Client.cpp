@@ -1,3 +1,4 @@
+// What is checked before a message is taken, and in which order things go when a client goes.
 #include "Client.h"
 
 #include "BlockedSignals.h"
@@ -124,11 +125,13 @@ kesto_status kesto_client::setConfiguration(const libkesto::MessageEncoder& conf
     return status;
 }
 
-// In the queue, and in a frame.
+// In the queue, and in a frame that the service takes.
 bool kesto_client::fits(std::size_t entryBytes, std::size_t reporterCount) const noexcept
 {
+    constexpr std::size_t mostReporters = 10'000;
     const std::size_t most = std::min(mailbox_.largestRecord(), platform::longestFrame);
-    return reporterCount < most && entryBytes + libkesto::frameOverhead(reporterCount) + sizeof(CallHead) <= most;
+    return reporterCount <= mostReporters
+        && entryBytes + libkesto::frameOverhead(reporterCount) + sizeof(CallHead) <= most;
 }
 
 kesto_status kesto_client::send(const libkesto::MessageEncoder& message, CallHead head,

@@ -1,3 +1,4 @@
+// One loop: answers first, then what callers gave, then sleep.
 #include "Courier.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// Who flushes waits for a place in the queue to be read, and then for all calls up to there to be answered.
 #include "Flushes.h"
 
 #include "CallTable.h"

@@ -1,3 +1,4 @@
+// Both halves of the handshake between callers and a thread that goes to sleep.
 #include "Mailbox.h"
 
 #include <sys/eventfd.h>

@@ -1,3 +1,4 @@
+// Heads that are written before their number is known, and widened in the rare case that one byte is too few.
 #include "MessageEncoder.h"
 
 #include "foundation/Cbor.h"

@@ -1,3 +1,4 @@
+// A socket that never blocks: what it does not take waits here.
 #include "ServiceConnection.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// The environment is asked first, then the places where the service is as packaged.
 #include "ServicePath.h"
 
 #include <algorithm>

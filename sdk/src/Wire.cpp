@@ -1,3 +1,4 @@
+// A call's shape is known, so its frame is written straight from what the caller gave, without values in between.
 #include "Wire.h"
 
 #include "platform/linux/FrameReader.h"
@@ -68,8 +69,7 @@ std::uint64_t argumentCount(kesto_operation operation) noexcept
 
 template <typename Integer> std::optional<Integer> integer(const Value* value)
 {
-    const auto number = value == nullptr ? std::nullopt : value->number();
-    return number ? number->exactly<Integer>() : std::nullopt;
+    return value == nullptr ? std::nullopt : value->exactly<Integer>();
 }
 
 bool readReporters(const Value& value, std::vector<kesto_reporter>& reporters)
@@ -79,7 +79,7 @@ bool readReporters(const Value& value, std::vector<kesto_reporter>& reporters)
         return false;
     reporters.clear();
     for (const Value& element : *array) {
-        const auto reporter = integer<kesto_reporter>(&element);
+        const auto reporter = element.exactly<kesto_reporter>();
         if (!reporter)
             return false;
         reporters.push_back(*reporter);

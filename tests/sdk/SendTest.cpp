@@ -11,10 +11,12 @@
 #include <cstddef>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <limits>
 #include <linux/audit.h>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <map>
+#include <numeric>
 #include <optional>
 #include <sys/prctl.h>
 #include <sys/syscall.h>
@@ -104,6 +106,52 @@ TEST_F(SendTest, RefusesAMessageOfMoreThanAQuarterOfTheQueue)
     EXPECT_EQ(send(small.add("text", std::string(500, 'x'))), Status::Ok);
     EXPECT_EQ(client_.flush(longEnough), Status::Ok);
     EXPECT_EQ(client_.send(small, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(200, 1)),
+              Status::TooLarge);
+}
+
+// In a queue with room for it the frame is the bound, whatever of it is entries and what is reporters.
+TEST_F(SendTest, SendsWhatFitsIntoAFrameAndRefusesWhatDoesNot)
+{
+    constexpr std::size_t longestFrame = std::size_t{1} << 20;
+    kesto::Options options;
+    options.queueBytes = std::size_t{8} << 20;
+    connect(sdk_test::answerObediently, options);
+    const std::vector<kesto::ReporterID> reporters(1000, std::numeric_limits<kesto::ReporterID>::min());
+    const auto sendText = [&](std::size_t length) {
+        kesto::Message message;
+        return client_.send(message.add("text", std::string(length, 'x')), Category::IO, EventType::Error, reporters);
+    };
+    std::size_t fits = 0;
+    std::size_t isTooLarge = longestFrame;
+    std::uint64_t sent = 0;
+    while (isTooLarge - fits > 1) {
+        const std::size_t length = std::midpoint(fits, isTooLarge);
+        const Status status = sendText(length);
+        if (status == Status::Ok) {
+            fits = length;
+            EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+            ++sent;
+        } else {
+            ASSERT_EQ(status, Status::TooLarge);
+            isTooLarge = length;
+        }
+    }
+    EXPECT_GT(fits, longestFrame - reporters.size() * 9 - 256) << "nearly all of a frame can be used";
+    EXPECT_EQ(client_.statistics().answered, sent);
+    EXPECT_EQ(client_.statistics().connections, 1U) << "the service took every one";
+}
+
+TEST_F(SendTest, SendsToAsManyReportersAsTheServiceTakes)
+{
+    constexpr std::size_t most = 10'000;
+    kesto::Options options;
+    options.queueBytes = std::size_t{1} << 20;
+    connect(sdk_test::answerObediently, options);
+    const kesto::Message message;
+    EXPECT_EQ(client_.send(message, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(most, 1)),
+              Status::Ok);
+    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.send(message, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(most + 1, 1)),
               Status::TooLarge);
 }
 
