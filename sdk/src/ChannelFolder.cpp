@@ -77,9 +77,9 @@ void removeIfEmpty(const std::string& root, std::span<const std::string> place)
     for (; !place.empty(); place = place.first(place.size() - 1)) {
         FileDescriptor folder = openFolder(AT_FDCWD, root.c_str(), 0);
         for (const std::string& name : place.first(place.size() - 1))
-            if (folder && enter(folder, name.c_str()) != 0)
+            if (!folder || enter(folder, name.c_str()) != 0)
                 return;
-        if (::unlinkat(folder.get(), place.back().c_str(), AT_REMOVEDIR) != 0)
+        if (!folder || ::unlinkat(folder.get(), place.back().c_str(), AT_REMOVEDIR) != 0)
             return;
     }
 }
