@@ -58,21 +58,21 @@ KestoReportingMessageStore::Outcome KestoReportingMessageStore::record(AudioEven
     const bool isError = category == AudioEventCategoryError || type == AudioEventTypeError;
     if (!isError && repeatsLast(kind, payload))
         return Outcome::Redundant;
-    if (!append(*number, payload, kind.last))
+    const std::size_t bytes = payload.roughBytes();
+    if (!append(*number, payload, bytes, kind.last))
         return Outcome::Full;
     ++size_;
     ++kind.count;
-    kind.isLastDecoded = payForDecoded(kind, payload);
+    kind.isLastDecoded = payForDecoded(kind, bytes);
     kind.lastDecoded = kind.isLastDecoded ? payload : foundation::Dictionary();
     return Outcome::Recorded;
 }
 
 // What a kind has paid for once, it keeps for its next payloads, which take as much as a rule.
-bool KestoReportingMessageStore::payForDecoded(Kind& kind, const foundation::Dictionary& payload)
+bool KestoReportingMessageStore::payForDecoded(Kind& kind, std::size_t bytes)
 {
     if (kind.last.kept_ != nullptr || kind.last.encoded_.size() > largestKeptDecoded)
         return false;
-    const std::size_t bytes = payload.roughBytes();
     if (bytes <= kind.bytesForDecoded)
         return true;
     if (!share_.grow(bytes - kind.bytesForDecoded))
@@ -114,11 +114,11 @@ std::optional<std::uint32_t> KestoReportingMessageStore::kindNamedLike(AudioEven
     return number;
 }
 
-bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Dictionary& payload, Payload& appended)
+bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Dictionary& payload, std::size_t bytes,
+                                        Payload& appended)
 {
-    const std::size_t size = textSize(payload);
-    const bool isLarge = size > largestEncoded;
-    if (isLarge && !share_.grow(size))
+    const bool isLarge = bytes > largestEncoded && textSize(payload) > largestEncoded;
+    if (isLarge && !share_.grow(bytes))
         return false;
     scratch_.clear();
     if (!isLarge)
@@ -127,7 +127,7 @@ bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Di
     char* place = allocate(sizeof head + scratch_.size());
     if (place == nullptr) {
         if (isLarge)
-            share_.shrink(size);
+            share_.shrink(bytes);
         return false;
     }
     std::memcpy(place, &head, sizeof head);

@@ -131,8 +131,9 @@ private:
     std::optional<std::uint32_t> kindOf(AudioEventCategory category, AudioEventType type);
     std::optional<std::uint32_t> kindNamedLike(AudioEventCategory category, AudioEventType type);
     [[nodiscard]] static bool repeatsLast(const Kind& kind, const foundation::Dictionary& payload);
-    [[nodiscard]] bool append(std::uint32_t kind, const foundation::Dictionary& payload, Payload& appended);
-    [[nodiscard]] bool payForDecoded(Kind& kind, const foundation::Dictionary& payload);
+    [[nodiscard]] bool append(std::uint32_t kind, const foundation::Dictionary& payload, std::size_t bytes,
+                              Payload& appended);
+    [[nodiscard]] bool payForDecoded(Kind& kind, std::size_t bytes);
     [[nodiscard]] char* allocate(std::size_t bytes);
 
     KestoReportingStorageShare share_;
