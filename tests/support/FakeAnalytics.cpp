@@ -1,3 +1,4 @@
+// Payloads are built when a test asks for them, never before: whether they are needed is for the test to say.
 #include "support/FakeAnalytics.h"
 
 #include <algorithm>

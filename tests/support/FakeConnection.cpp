@@ -1,3 +1,4 @@
+// The rules that a real connection keeps are expectations here: no call before reading begins, none after the end.
 #include "support/FakeConnection.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// What a session was told is written down; events come, and sessions complete, when a test has them do so.
 #include "support/FakeKernelTrace.h"
 
 #include <utility>

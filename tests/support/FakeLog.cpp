@@ -1,3 +1,4 @@
+// Lines are kept as they come, and shown in full by a test that fails.
 #include "support/FakeLog.h"
 
 #include <algorithm>

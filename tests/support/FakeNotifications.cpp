@@ -1,3 +1,4 @@
+// Handlers run on the queue that they were registered with, as with the real ones.
 #include "support/FakeNotifications.h"
 
 namespace support {

@@ -1,3 +1,4 @@
+// A sample is a copy of what is published at that moment; a difference is what the platform would make of two.
 #include "support/FakeReportingChannels.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// Items wait until a test runs them, in the order of all queues together; a serial queue never runs two at once.
 #include "support/FakeWorkQueues.h"
 
 #include <algorithm>

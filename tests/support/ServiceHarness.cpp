@@ -1,3 +1,4 @@
+// The service is made as its entry point makes it, on fakes.
 #include "support/ServiceHarness.h"
 
 namespace support {
