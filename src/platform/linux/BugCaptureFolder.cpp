@@ -59,9 +59,9 @@ std::string utcText(double time)
 void remove(int directory, const std::string& name, int folder)
 {
     const std::string hidden(going);
-    static_cast<void>(removeTreeAt(folder, hidden)); // of an attempt that failed
+    removeTreeAt(folder, hidden); // of an attempt that failed
     if (::renameat(directory, name.c_str(), folder, hidden.c_str()) == 0)
-        static_cast<void>(removeTreeAt(folder, hidden)); // what stays is removed at the next start
+        removeTreeAt(folder, hidden); // what stays is removed at the next start
 }
 
 std::error_code syncDirectory(int directory)
@@ -125,7 +125,7 @@ void BugCaptureFolder::removeLeftovers(int folder)
 {
     for (const std::string& name : namesIn(folder, everything).value_or(std::vector<std::string>()))
         if (name == coming || name == going)
-            static_cast<void>(removeTreeAt(folder, name));
+            removeTreeAt(folder, name);
 }
 
 std::error_code BugCaptureFolder::checkFreeSpace() const
@@ -222,12 +222,12 @@ std::error_code BugCaptureFolder::add(const std::string& name, const std::vector
     makeRoom(folder->get(), isTooMuch ? 0 : bytes);
 
     const std::string hidden(coming);
-    static_cast<void>(removeTreeAt(folder->get(), hidden)); // of an attempt that failed
+    removeTreeAt(folder->get(), hidden); // of an attempt that failed
     auto error = write(folder->get(), hidden, files, isTooMuch ? std::vector<File>() : state);
     if (!error && ::renameat(folder->get(), hidden.c_str(), folder->get(), name.c_str()) != 0)
         error = lastError();
     if (error)
-        static_cast<void>(removeTreeAt(folder->get(), hidden));
+        removeTreeAt(folder->get(), hidden);
     else
         error = syncDirectory(folder->get());
     return error;

@@ -25,22 +25,18 @@ struct CloseDirectory {
     void operator()(DIR* directory) const { ::closedir(directory); }
 };
 
-std::error_code removeTree(int directory, const std::string& name, unsigned depth)
+bool removeTree(int directory, const std::string& name, unsigned depth)
 {
     if (::unlinkat(directory, name.c_str(), 0) == 0)
-        return {};
+        return true;
     if (errno != EISDIR || depth == 0)
-        return lastError();
+        return false;
     const auto opened = openDirectoryAt(directory, name);
-    if (!opened)
-        return opened.error();
-    const auto names = namesIn(opened->get(), everything);
-    if (!names)
-        return names.error();
-    for (const std::string& inside : *names)
-        if (const auto error = removeTree(opened->get(), inside, depth - 1))
-            return error;
-    return ::unlinkat(directory, name.c_str(), AT_REMOVEDIR) == 0 ? std::error_code() : lastError();
+    const auto names = opened ? namesIn(opened->get(), everything) : std::unexpected(opened.error());
+    return names
+        && std::ranges::all_of(*names,
+                               [&](const std::string& inside) { return removeTree(opened->get(), inside, depth - 1); })
+        && ::unlinkat(directory, name.c_str(), AT_REMOVEDIR) == 0;
 }
 
 } // namespace
@@ -128,7 +124,7 @@ std::uint64_t bytesOfFilesIn(int directory)
     return bytes;
 }
 
-std::error_code removeTreeAt(int directory, const std::string& name)
+bool removeTreeAt(int directory, const std::string& name)
 {
     return removeTree(directory, name, deepestTree);
 }

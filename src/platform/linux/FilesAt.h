@@ -32,7 +32,7 @@ namespace platform {
 // How many bytes the files of a folder have, without those of folders in it.
 [[nodiscard]] std::uint64_t bytesOfFilesIn(int directory);
 
-// Removes a file, a link, or a folder with everything in it.
-[[nodiscard]] std::error_code removeTreeAt(int directory, const std::string& name);
+// Removes a file, a link, or a folder with everything in it; false when there is none, or something of it stays.
+bool removeTreeAt(int directory, const std::string& name);
 
 } // namespace platform
