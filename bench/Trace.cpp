@@ -36,6 +36,7 @@ class RecordedTrace final : public platform::KernelTrace {
 public:
     explicit RecordedTrace(std::vector<trace_point> events) : events_(std::move(events)) { }
 
+    bool isAvailable() override { return true; }
     std::unique_ptr<platform::KernelTraceSession> createTraceSession() override
     {
         return std::make_unique<Session>(events_);

@@ -57,6 +57,11 @@ std::unique_ptr<BugCaptureReporter> AbsentBugCapture::makeReporter()
     return std::make_unique<AbsentBugCaptureReporter>();
 }
 
+bool AbsentKernelTrace::isAvailable()
+{
+    return false;
+}
+
 std::unique_ptr<KernelTraceSession> AbsentKernelTrace::createTraceSession()
 {
     return nullptr;

@@ -41,6 +41,7 @@ public:
 // There is no kernel trace: no session can be made.
 class AbsentKernelTrace final : public KernelTrace {
 public:
+    [[nodiscard]] bool isAvailable() override;
     [[nodiscard]] std::unique_ptr<KernelTraceSession> createTraceSession() override;
 };
 

@@ -41,7 +41,9 @@ public:
 class KernelTrace {
 public:
     virtual ~KernelTrace() = default;
-    // Null on a system that cannot trace; the "Tracing" feature then counts as off.
+    // Whether this system can trace. Where it cannot, the "Tracing" feature counts as off.
+    [[nodiscard]] virtual bool isAvailable() = 0;
+    // Null on a system that cannot.
     [[nodiscard]] virtual std::unique_ptr<KernelTraceSession> createTraceSession() = 0;
 };
 

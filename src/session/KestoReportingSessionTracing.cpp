@@ -27,7 +27,9 @@ bool allowsKernelTrace(const foundation::Dictionary& configuration)
 
 bool KestoReportingSession::mayBeTraced() const
 {
-    return serviceType_ == AudioServiceTypeTest && platform::current().featureFlags.isEnabled("Sonalis", "Tracing");
+    platform::Platform& platform = platform::current();
+    return serviceType_ == AudioServiceTypeTest && platform.featureFlags.isEnabled("Sonalis", "Tracing")
+        && platform.kernelTrace.isAvailable();
 }
 
 void KestoReportingSession::setupTracing(const std::optional<std::string>& fileName)

@@ -45,6 +45,7 @@ TEST(AbsentBugCapture, MakesSignaturesAndAnswersThatNothingWasTaken)
 
 TEST(AbsentKernelTrace, HasNoSessions)
 {
+    EXPECT_FALSE(AbsentKernelTrace().isAvailable());
     EXPECT_EQ(AbsentKernelTrace().createTraceSession(), nullptr);
 }
 

@@ -166,6 +166,14 @@ TEST_F(SessionTracing, DoesNotStartWhileTheFeatureIsOff)
     expectNoTraceIsStarted();
 }
 
+TEST_F(SessionTracing, DoesNotStartOnASystemThatCannotTrace)
+{
+    EXPECT_TRUE(session->mayBeTraced());
+    platform.kernelTrace.available = false;
+    EXPECT_FALSE(session->mayBeTraced());
+    expectNoTraceIsStarted();
+}
+
 TEST_F(SessionTracing, DoesNotStartInASessionOfAnotherServiceType)
 {
     for (const AudioServiceType type : {0, 10, 12, 65535}) {

@@ -41,6 +41,7 @@ public:
     // Delivers the event to every running session that filters for its code.
     void deliver(const platform::KernelTraceEvent& event);
 
+    bool isAvailable() override { return available; }
     std::unique_ptr<platform::KernelTraceSession> createTraceSession() override;
 
 private:

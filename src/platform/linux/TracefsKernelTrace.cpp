@@ -103,6 +103,12 @@ TracefsKernelTrace::~TracefsKernelTrace()
         thread_.join();
 }
 
+bool TracefsKernelTrace::isAvailable()
+{
+    const foundation::Lock lock(lock_);
+    return setUp();
+}
+
 std::unique_ptr<KernelTraceSession> TracefsKernelTrace::createTraceSession()
 {
     const foundation::Lock lock(lock_);

@@ -50,7 +50,9 @@ public:
     TracefsKernelTrace(const TracefsKernelTrace&) = delete;
     TracefsKernelTrace& operator=(const TracefsKernelTrace&) = delete;
 
-    // The first one sets the instance up, which takes some 30 ms. Why there is none is logged when it changes.
+    // The first call of either sets the instance up, which takes some 30 ms. Why there is none is logged when it
+    // changes.
+    [[nodiscard]] bool isAvailable() override;
     [[nodiscard]] std::unique_ptr<KernelTraceSession> createTraceSession() override;
 
 private:

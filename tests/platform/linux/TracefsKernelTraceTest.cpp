@@ -272,6 +272,7 @@ TEST_F(TracefsKernelTraceTest, CountsAsOffWithoutTracefsAndSaysSoOnce)
 {
     const std::string mounted = support::readFile(tree.mounts);
     support::writeFile(tree.mounts, "");
+    EXPECT_FALSE(trace.isAvailable());
     EXPECT_EQ(trace.createTraceSession(), nullptr);
     EXPECT_EQ(trace.createTraceSession(), nullptr);
     EXPECT_THAT(log.take(),
@@ -282,7 +283,8 @@ TEST_F(TracefsKernelTraceTest, CountsAsOffWithoutTracefsAndSaysSoOnce)
     EXPECT_EQ(trace.createTraceSession(), nullptr);
     EXPECT_THAT(log.take(), SizeIs(1)) << "another reason";
     fs::rename(tree.instance / "kept", tree.instance / "tracing_on");
-    EXPECT_NE(trace.createTraceSession(), nullptr) << "what was missing came";
+    EXPECT_TRUE(trace.isAvailable()) << "what was missing came";
+    EXPECT_NE(trace.createTraceSession(), nullptr);
     EXPECT_THAT(log.take(), IsEmpty());
 }
 
