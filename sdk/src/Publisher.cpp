@@ -68,12 +68,6 @@ try {
     return false;
 }
 
-void kesto_publisher::free(std::unique_ptr<kesto_publisher> publisher) noexcept
-{
-    if (publisher->process_ != ::getpid())
-        static_cast<void>(publisher.release()); // the thread, the lock and the files are the parent's
-}
-
 kesto_publisher::~kesto_publisher()
 {
     isEnding_.store(true);
@@ -146,12 +140,13 @@ int kesto_publisher::write(bool isRefresh) noexcept
 int kesto_publisher::write(Published& published, Time now) noexcept
 {
     published.channel->setChanged(false); // before its value is read: what changes from here on is for the next time
-    int error = ENOMEM;
+    int error = 0;
     try {
         text_.clear();
         published.channel->appendText(text_, now);
         error = published.folder->replace(published.name, text_);
     } catch (const std::bad_alloc&) {
+        error = ENOMEM;
     }
     ++(error == 0 ? filesWritten_ : filesFailed_);
     if (error != 0)

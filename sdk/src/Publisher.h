@@ -20,6 +20,7 @@
 #include <string>
 #include <sys/types.h>
 #include <thread>
+#include <unistd.h>
 #include <vector>
 
 namespace libkesto {
@@ -40,12 +41,13 @@ public:
 
     // Null, with `errno`, when the system has no descriptor or no thread. May throw std::bad_alloc.
     [[nodiscard]] static std::unique_ptr<kesto_publisher> create(Settings settings);
-    // Ends the publisher, unless this process is another one than made it.
-    static void free(std::unique_ptr<kesto_publisher> publisher) noexcept;
     ~kesto_publisher();
     kesto_publisher(const kesto_publisher&) = delete;
     kesto_publisher& operator=(const kesto_publisher&) = delete;
 
+    // Whether this process made it. In a child that was forked off, the thread, the lock and the files are the
+    // parent's.
+    [[nodiscard]] bool isOfThisProcess() const noexcept { return process_ == ::getpid(); }
     // What channels tell their changes.
     [[nodiscard]] libkesto::ChangeBell& bell() noexcept { return bell_; }
     // Writes the channel's first file; null, and the status, when it cannot be. May throw std::bad_alloc.
@@ -75,7 +77,7 @@ private:
     int write(Published& published, Time now) noexcept KESTO_REQUIRES(lock_);
     [[nodiscard]] std::shared_ptr<libkesto::ChannelFolder> folder(libkesto::ChannelPlace place) KESTO_REQUIRES(lock_);
 
-    const pid_t process_; // that made it: a child that was forked off has no such thread
+    const pid_t process_; // that made it
     const Settings settings_;
     const std::string temporaryName_;
     libkesto::ChangeBell bell_;

@@ -132,8 +132,8 @@ kesto_status kesto_publisher_flush(kesto_publisher* publisher)
 
 void kesto_publisher_free(kesto_publisher* publisher)
 {
-    if (publisher != nullptr)
-        kesto_publisher::free(std::unique_ptr<kesto_publisher>(publisher));
+    if (publisher != nullptr && publisher->isOfThisProcess())
+        delete publisher;
 }
 
 void kesto_publisher_get_statistics(const kesto_publisher* publisher, kesto_publisher_statistics* statistics,
