@@ -2,6 +2,7 @@
 // about.
 #include "platform/linux/EventDatabase.h"
 
+#include <cassert>
 #include <cerrno>
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -231,10 +232,14 @@ EventDatabase::Expected<> EventDatabase::insert(std::span<const EventRow> rows)
 // The texts stay where they are until the statement has run.
 void EventDatabase::bind(const Statement& statement, int firstParameter, const EventRow& row)
 {
-    ::sqlite3_bind_double(statement.get(), firstParameter, row.time);
-    ::sqlite3_bind_text(statement.get(), firstParameter + 1, row.name.data(), count(row.name.size()), SQLITE_STATIC);
-    ::sqlite3_bind_text(statement.get(), firstParameter + 2, row.payload.data(), count(row.payload.size()),
-                        SQLITE_STATIC);
+    const auto bindText = [&statement](int parameter, std::string_view text) {
+        return ::sqlite3_bind_text(statement.get(), parameter, text.data(), count(text.size()), SQLITE_STATIC)
+            == SQLITE_OK;
+    };
+    [[maybe_unused]] const bool areBound = // nothing is copied, and no event comes near the length that SQLite takes
+        ::sqlite3_bind_double(statement.get(), firstParameter, row.time) == SQLITE_OK
+        && bindText(firstParameter + 1, row.name) && bindText(firstParameter + 2, row.payload);
+    assert(areBound);
 }
 
 EventDatabase::Expected<> EventDatabase::commit()

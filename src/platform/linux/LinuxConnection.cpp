@@ -216,7 +216,7 @@ std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
 // it. Once a connection, so that nobody can have the service keep requests or descriptors in any number.
 std::expected<void, Connection::Violation> LinuxConnection::askForTraceMarker(const foundation::Value& call)
 {
-    const auto number = call.number() ? call.number()->exactly<std::uint64_t>() : std::nullopt;
+    const auto number = call.exactly<std::uint64_t>();
     if (!number)
         return std::unexpected(Violation{"a call's number is an unsigned 64-bit integer"});
     if (std::exchange(hasAskedForTraceMarker_, true))

@@ -174,6 +174,18 @@ TEST_F(FileSystem, WritesAFileAtOnceWhenItIsCommitted)
     EXPECT_EQ(permissionsOf(root / "a.json"), 0644U);
 }
 
+TEST_F(FileSystem, LetsEverybodyReadItsFilesWhateverTheUmask)
+{
+    for (const mode_t mask : {0U, 022U, 077U, 0777U}) {
+        const fs::path path = root / std::to_string(mask);
+        const mode_t before = ::umask(mask);
+        const auto written = write(path, "text");
+        ::umask(before);
+        EXPECT_TRUE(written);
+        EXPECT_EQ(permissionsOf(path), 0644U);
+    }
+}
+
 TEST_F(FileSystem, TakesThePlaceOfAnEarlierFileAndLeavesItsReadersTheOldOne)
 {
     ASSERT_TRUE(write(root / "a.json", "old"));
