@@ -1,3 +1,5 @@
+// The database is opened through SQLite's URI, which alone can say that it does not change; what happens to its files
+// is seen by their numbers and by inotify.
 #include "EventStore.h"
 
 #include <array>

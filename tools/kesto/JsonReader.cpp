@@ -1,3 +1,5 @@
+// RapidJSON tells piece by piece what it reads, and keeps nothing: values are put together here, without recursion, so
+// that no text is too deep to be refused.
 #include "JsonReader.h"
 
 #include <fmt/format.h>
@@ -44,7 +46,7 @@ public:
         return true;
     }
 
-    bool StartObject() { return depth_ >= visitDepth_ && ++depth_ <= deepest; }
+    bool StartObject() { return depth_ >= visitDepth_ && StartArray(); }
     bool EndObject(rapidjson::SizeType count)
     {
         Dictionary::Entries entries;

@@ -1,3 +1,4 @@
+// The forms are tried one after the other; the first that takes the whole text is the one that was meant.
 #include "Moment.h"
 
 #include <array>

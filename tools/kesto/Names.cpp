@@ -1,3 +1,4 @@
+// The vocabulary has functions from number to name only: here every number that has a name of its own is tried.
 #include "Names.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// One rule for all three directories; they differ in their names only.
 #include "Places.h"
 
 #include <cstdlib>

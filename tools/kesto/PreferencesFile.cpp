@@ -1,3 +1,5 @@
+// Reading, changing and writing happen under a lock on the directory, since the file itself is replaced each time. What
+// the service would not read is not written.
 #include "PreferencesFile.h"
 
 #include "Replacement.h"

@@ -1,3 +1,4 @@
+// The new file lies on the disk as a whole before it takes the name, so that losing power leaves one or the other.
 #include "Replacement.h"
 
 #include "platform/linux/FileDescriptor.h"

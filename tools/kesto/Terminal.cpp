@@ -1,3 +1,4 @@
+// Characters are told apart by the first bytes of their UTF-8, whether or not the rest is in order.
 #include "Terminal.h"
 
 #include "foundation/Json.h"

@@ -1,3 +1,4 @@
+// Of what came before, only the last message of each kind is kept, so that sessions of any length are read.
 #include "Timeline.h"
 
 #include "Terminal.h"

@@ -4,6 +4,8 @@
 
 #include "foundation/Value.h"
 
+#include <cstdint>
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>

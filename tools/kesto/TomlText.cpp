@@ -1,3 +1,5 @@
+// A statement is asked of the parser rather than searched for: each is parsed by itself, and says so which key it is
+// about. Only the ends of lines that could end one are tried.
 #include "TomlText.h"
 
 #include "foundation/Json.h"

@@ -1,3 +1,4 @@
+// The tool inherits the test's environment but for what would lead it to a service of this machine.
 #include "tools/kesto/Tool.h"
 
 #include <gtest/gtest.h>
