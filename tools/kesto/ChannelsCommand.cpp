@@ -147,6 +147,7 @@ Dictionary describe(const ReportingChannel& channel)
         return description.with("kind", "simple").with("value", channel.value);
     if (isKind(channel, platform::ChannelFormat::Histogram)) {
         std::vector<Value> buckets;
+        buckets.reserve(channel.buckets.size());
         for (const auto& bucket : channel.buckets)
             buckets.emplace_back(Dictionary{{"lower", bucket.lower}, {"upper", bucket.upper}, {"hits", bucket.hits}});
         return description.mergedWith({{"kind", "histogram"},
@@ -155,6 +156,7 @@ Dictionary describe(const ReportingChannel& channel)
                                        {"buckets", Array(std::move(buckets))}});
     }
     std::vector<Value> states;
+    states.reserve(channel.states.size());
     for (const auto& state : channel.states)
         states.emplace_back(Dictionary{{"name", state.name},
                                        {"transitions", state.transitions},
