@@ -64,8 +64,8 @@ public:
     // Ends the run and drops what it recorded. Nothing happens to a session that is not started.
     void stop();
 
-    // Whether sessions of this service type may run kernel traces: those for tests, where the feature is enabled and the
-    // system can trace.
+    // Whether sessions of this service type may run kernel traces: those for tests, where the feature is enabled and
+    // the system can trace.
     [[nodiscard]] bool mayBeTraced() const;
     // Prepares a trace from a trace-parameters file, in the place of one that was prepared or is running. Without a
     // file nothing changes.
