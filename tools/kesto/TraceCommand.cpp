@@ -34,10 +34,10 @@ CLI::App* addRecordCommand(CLI::App& trace, TraceOptions& options)
     command->add_option("--output", recording.output, "Keep a copy of the results file here");
     command->add_option("--socket", recording.socket, "The service's socket, if it is not at its usual place");
     command->add_option("--results", recording.results, "The service's results file, if it is not at its usual place");
-    command->add_option("COMMAND", options.program, "The program to run, behind --, and its arguments")->required();
+    command->add_option("COMMAND", options.program, "The program to run, and its arguments; put -- before")->required();
     command->prefix_command(); // its arguments are not this tool's
     command->footer(R"(Measures a program in one line:
-  kesto trace record --params mixer.plist -- ./mixer --seconds 10
+  kesto trace record --params mixer.plist -- ./mixer -t 10
 Exit status: that of the program; 1 if nothing could be recorded, 127 if it could not be run.)");
     return command;
 }

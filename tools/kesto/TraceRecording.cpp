@@ -93,24 +93,26 @@ public:
         // The kind of trace is left out: the service knows one, and takes no client's word for it.
         kesto::Message configuration;
         configuration.add("KestoReportingPellorinPlistFilePath", parameters.native());
-        ask([&](auto answered) { return client_.createSession(reporter_, answered); });
-        ask([&](auto answered) { return client_.setServiceType(kesto::ServiceType::Test, reporter_, answered); });
-        ask([&](auto answered) { return client_.setConfiguration(configuration, reporter_, answered); });
+        ask([&](const auto& answered) { return client_.createSession(reporter_, answered); });
+        ask([&](const auto& answered) {
+            return client_.setServiceType(kesto::ServiceType::Test, reporter_, answered);
+        });
+        ask([&](const auto& answered) { return client_.setConfiguration(configuration, reporter_, answered); });
         // A start is answered when it ends, so the next call tells that it was carried out.
         if (const auto status = client_.startSession(reporter_); status != kesto::Status::Ok)
             fail("the session cannot be started: {}", kesto::errorText(status));
-        ask([&](auto answered) { return client_.validate(reporter_, answered); });
+        ask([&](const auto& answered) { return client_.validate(reporter_, answered); });
         waitForTrace();
     }
 
     // When it returns, the service has written the results, if it could.
     void stop()
     {
-        ask([&](auto answered) { return client_.stopSession(reporter_, answered); });
+        ask([&](const auto& answered) { return client_.stopSession(reporter_, answered); });
     }
 
 private:
-    using Call = std::function<kesto::Status(kesto::AnswerCallback answered)>;
+    using Call = std::function<kesto::Status(const kesto::AnswerCallback& answered)>;
 
     static constexpr std::chrono::seconds patience{30}; // until an answer
     static constexpr std::chrono::seconds tracePatience{2}; // until a trace that was started is seen here
@@ -225,6 +227,7 @@ private:
 int spawn(std::vector<std::string> command, const KeyboardSignals& signals, pid_t& process)
 {
     std::vector<char*> words;
+    words.reserve(command.size() + 1);
     for (std::string& word : command)
         words.push_back(word.data());
     words.push_back(nullptr);

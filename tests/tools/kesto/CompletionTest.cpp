@@ -51,8 +51,8 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
 
 TEST_F(Completion, NamesEveryOptionThatTheToolHas)
 {
-    for (const std::string verb :
-         {"channels", "client", "events", "summary", "notify", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
+    for (const std::string verb : {"channels", "client", "events", "summary", "notify", "trace", "trace record",
+                                   "prefs get", "prefs set", "prefs unset", "prefs list"}) {
         std::istringstream help(tool.runShell("$kesto " + verb + " --help").output);
         const auto offered = completions(verb + " --");
         for (std::string word; help >> word;)
@@ -66,6 +66,9 @@ TEST_F(Completion, NamesFiles)
 {
     support::writeFile(directory.path() / "summary.json", "");
     EXPECT_THAT(completions("summary sum"), ElementsAre("summary.json"));
+    EXPECT_THAT(completions("trace sum"), ElementsAre("summary.json"));
+    EXPECT_THAT(completions("trace rec"), ElementsAre("record"));
+    EXPECT_THAT(completions("trace record --params sum"), ElementsAre("summary.json"));
     EXPECT_THAT(completions("events --database s"), UnorderedElementsAre("summary.json", "state"));
     EXPECT_THAT(completions("notify --directory s"), ElementsAre("state"));
 }
