@@ -26,7 +26,9 @@ constexpr std::array groups{
     Group{"stored", "messages a second that become stored events", measureStored},
     Group{"session", "recording a million messages: time and memory", measureSession},
     Group{"end", "the end of a session of a million messages", measureSessionEnd},
+    Group{"starving", "what others wait while a long session ends", measureLongStop},
     Group{"lookup", "finding a session among 10,000 clients", measureLookup},
+    Group{"notification", "telling all sessions that a setting changed", measureNotification},
     Group{"idle", "wake-ups and memory with nothing to do", measureIdle},
     Group{"start", "from starting the process to its first answer", measureStart},
     Group{"log", "a log statement below the threshold", measureLogStatement},
@@ -50,7 +52,7 @@ void printHelp()
                "  --help             this text\n\nGroups:\n",
                Options::fewestRounds, Options().rounds, KESTO_BENCH_SERVICE);
     for (const Group& group : groups)
-        fmt::print("  {:<10} {}\n", group.name, group.what);
+        fmt::print("  {:<12} {}\n", group.name, group.what);
 }
 
 // Nothing when the program is done already, or cannot go on: then with that exit status.
