@@ -1,5 +1,5 @@
-// The service shows in two places that it traces: a client that asked for it may emit events, and a new results file
-// takes the place of the old one. Whoever has been refused for any reason sees neither, and is told where to look.
+// That the service traces shows three times: a start is answered at once, a client that asked for it may emit events, and
+// a new results file takes the place of the old one. Whoever is refused on the way is told where to look.
 #include "TraceRecording.h"
 
 #include "Commands.h"
@@ -98,10 +98,17 @@ public:
             return client_.setServiceType(kesto::ServiceType::Test, reporter_, answered);
         });
         ask([&](const auto& answered) { return client_.setConfiguration(configuration, reporter_, answered); });
-        // A start is answered when it ends, so the next call tells that it was carried out.
-        if (const auto status = client_.startSession(reporter_); status != kesto::Status::Ok)
+        // Where the service may trace, a start is answered before the next call; else it is answered when it ends.
+        if (const auto status = client_.startSession(reporter_, [this](const auto& answer) { takeStart(answer); });
+            status != kesto::Status::Ok)
             fail("the session cannot be started: {}", kesto::errorText(status));
         ask([&](const auto& answered) { return client_.validate(reporter_, answered); });
+        {
+            const std::scoped_lock lock(lock_);
+            if (!mayBeTraced_)
+                fail("the service does not trace. Either the feature is off (feature-flags.toml: [Sonalis] Tracing = "
+                     "true), or there is no tracefs that it may use: its log says so");
+        }
         waitForTrace();
     }
 
@@ -152,6 +159,12 @@ private:
         changed_.notify_all();
     }
 
+    void takeStart(const kesto::Answer& answer)
+    {
+        const std::scoped_lock lock(lock_);
+        mayBeTraced_ |= answer.ok();
+    }
+
     void stateChanged(const kesto::StateChange& change)
     {
         if (change.state != kesto::State::Disconnected)
@@ -173,9 +186,8 @@ private:
             if (!problem_.empty())
                 throw std::runtime_error(problem_);
             if (std::chrono::steady_clock::now() > end)
-                fail("the service does not trace. Either the feature is off (feature-flags.toml: [Sonalis] Tracing = "
-                     "true), or there is no tracefs that it may use, or the parameters file asks for no kernel trace; "
-                     "its log says which");
+                fail("the service has begun no trace: either the parameters file asks for none of the kernel, or too "
+                     "many run already; its log says which");
             changed_.wait_for(lock, std::chrono::milliseconds(1)); // nobody tells when it begins
         }
     }
@@ -184,6 +196,7 @@ private:
     std::mutex lock_;
     std::condition_variable changed_;
     bool isAnswered_ = false; // the last call
+    bool mayBeTraced_ = false;
     std::string problem_;
     kesto::Client client_; // ends first: its thread calls what is above
 };
