@@ -1,5 +1,5 @@
-// That the service traces shows three times: a start is answered at once, a client that asked for it may emit events, and
-// a new results file takes the place of the old one. Whoever is refused on the way is told where to look.
+// That the service traces shows three times: a start is answered at once, a client that asked for it may emit events,
+// and a new results file takes the place of the old one. Whoever is refused on the way is told where to look.
 #include "TraceRecording.h"
 
 #include "Commands.h"
