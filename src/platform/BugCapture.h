@@ -36,7 +36,7 @@ public:
     // How whoever asks for snapshots is at that moment, to be kept in them: it is asked with each request, where and
     // when that is made. To be set before the first; none unless it is.
     using StateDescription = std::function<foundation::Value()>;
-    virtual void setStateDescription(StateDescription /*describe*/) { }
+    virtual void setStateDescription(const StateDescription& /*describe*/) { }
 };
 
 } // namespace platform

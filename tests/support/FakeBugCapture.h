@@ -29,7 +29,7 @@ public:
         ++reportersMade_;
         return std::make_unique<Reporter>(snapshots_);
     }
-    void setStateDescription(StateDescription describe) override { describe_ = std::move(describe); }
+    void setStateDescription(const StateDescription& describe) override { describe_ = describe; }
 
 private:
     class Reporter final : public platform::BugCaptureReporter {

@@ -54,7 +54,7 @@ public:
     }
 
     [[nodiscard]] std::unique_ptr<BugCaptureReporter> makeReporter() override;
-    void setStateDescription(StateDescription describe) override { describeState_ = std::move(describe); }
+    void setStateDescription(const StateDescription& describe) override { describeState_ = describe; }
 
     // That were asked for too soon after others, since the start.
     [[nodiscard]] std::uint64_t refusedSnapshots() const;
