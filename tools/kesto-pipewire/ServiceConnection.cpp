@@ -15,6 +15,10 @@ namespace {
 constexpr std::size_t queueBytes = 1024 * 1024; // some thousands of messages, should the service be slow
 constexpr auto longestFarewell = std::chrono::seconds(3);
 
+// In the kernel's trace, with the session as argument: it is told that a stream begins to run, and that it ceases to.
+constexpr std::uint32_t streamBegins = 0x21044080;
+constexpr std::uint32_t streamCeases = 0x21044084;
+
 std::string textOf(const Payload& payload)
 {
     std::string text;
@@ -45,11 +49,13 @@ void ServiceConnection::open(Handlers handlers)
     options.queueBytes = queueBytes;
     options.wakeOnSend = true;
     options.reconnect = true;
+    options.trace = true;
     options.stateChanged = [this](const kesto::StateChange& change) { stateChanged(change); };
     if (const auto status = client_.open(options); status == kesto::Status::InvalidArgument)
         throw std::system_error(EINVAL, std::generic_category(), "unusable socket path");
     else if (status != kesto::Status::Ok)
         throw std::system_error(errno, std::generic_category(), kesto::errorText(status));
+    tracer_ = kesto::Tracer(client_);
 }
 
 bool ServiceConnection::close()
@@ -130,6 +136,10 @@ void ServiceConnection::start(ReporterID session)
 
 void ServiceConnection::send(ReporterID session, Category category, EventType type, const Payload& message)
 {
+    if (type == EventType::Start)
+        tracer_.emit(streamBegins, static_cast<std::uint64_t>(session));
+    else if (type == EventType::Stop)
+        tracer_.emit(streamCeases, static_cast<std::uint64_t>(session));
     note(session, client_.send(encode(message), category, type, session), [&] {
         return fmt::format("{} {}: {}", KestoReportingUtilityCategoryString(static_cast<AudioEventCategory>(category)),
                            KestoReportingUtilityTypeString(static_cast<AudioEventType>(type)), textOf(message));

@@ -8,6 +8,8 @@
 #include "kesto-pipewire/Loop.h"
 #include "kesto-pipewire/ReportingService.h"
 
+#include <kesto/trace.hpp>
+
 #include <atomic>
 #include <cstdint>
 #include <functional>
@@ -57,6 +59,7 @@ private:
     bool saidThatItIsAway_ = false;
     std::uint64_t refusedCalls_ = 0;
     kesto::Message message_; // used again for every call, so that none allocates
+    kesto::Tracer tracer_; // emits nothing while nobody traces
     kesto::Client client_; // last: its thread ends before what its callback uses
 };
 
