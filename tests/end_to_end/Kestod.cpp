@@ -2,6 +2,8 @@
 // what it promises must hold for whoever pulls the plug. What it stored is read as anyone may read it, by SQL.
 #include "end_to_end/Kestod.h"
 
+#include "end_to_end/WireClient.h"
+
 #include <charconv>
 #include <csignal>
 #include <fcntl.h>
@@ -45,6 +47,12 @@ Kestod::~Kestod()
     kill();
     if (testing::Test::HasFailure())
         std::fprintf(stderr, "--- log of the service:\n%s", log().c_str());
+}
+
+void Kestod::startAndAwait()
+{
+    start();
+    static_cast<void>(WireClient(socketPath()));
 }
 
 void Kestod::start(const InheritedDescriptors& inherited)

@@ -60,6 +60,8 @@ public:
 
     // Starts the process; clients that connect at once wait for it.
     void start(const InheritedDescriptors& inherited = {});
+    // The same, for clients that do not wait: returns when the service listens.
+    void startAndAwait();
     void kill();
     // Waits for the process to end by itself.
     [[nodiscard]] int exitStatus();

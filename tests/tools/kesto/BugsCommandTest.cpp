@@ -164,7 +164,7 @@ TEST_F(BugsCommand, ReadsTheDirectoryThatItIsTold)
 TEST_F(BugsCommand, ShowsWhatARealServiceCaptured)
 {
     end_to_end::Kestod kestod({{"device.toml", "InternalBuild = true"}}, {{"KESTO_LOG", "default,kerb=info"}});
-    kestod.start();
+    kestod.startAndAwait();
     Tool beside{kestod.directory()};
     const std::string report = R"(["send", {"Haptic_Active_Hardware_Time_Seconds": )";
     static_cast<void>(beside.print({"client", "--socket", kestod.socketPath()},

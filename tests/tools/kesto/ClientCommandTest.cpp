@@ -37,7 +37,7 @@ std::string answer(int call, const std::string& operation, const std::string& va
 
 class ClientCommand : public testing::Test {
 protected:
-    void SetUp() override { kestod.start(); }
+    void SetUp() override { kestod.startAndAwait(); }
 
     // With --wait, since what does not come would be waited for.
     [[nodiscard]] Finished run(const std::string& input) const

@@ -321,10 +321,9 @@ TEST_F(PrefsCommand, FindsTheDirectoryWhereItIsTold)
 TEST(PrefsRoad, AChangeReachesASessionAndItsSummary)
 {
     end_to_end::Kestod kestod(end_to_end::Kestod::Files{{"device.toml", "InternalBuild = true\n"}});
-    kestod.start();
+    kestod.startAndAwait();
     const Tool tool(kestod.directory());
     const std::string name = "Küche \"radio\"\n☕ \\ 'x'";
-    end_to_end::WireClient connected(kestod.socketPath()); // the service listens
     const auto client = tool.start({"client", "--socket", kestod.socketPath()});
     client->write("[\"create\", 1]\n[\"start\", 1]\n[\"getAllReporters\"]\n");
     ASSERT_THAT(client->waitForOutput("getAllReporters"), HasSubstr("\"values\":[[1]]"));

@@ -28,11 +28,6 @@ protected:
         tool.setVariable("LOGS_DIRECTORY=" + path("logs"));
     }
     [[nodiscard]] std::string path(const char* name) const { return kestod.directory() / name; }
-    void start()
-    {
-        kestod.start();
-        ASSERT_TRUE(end_to_end::waitUntil([this] { return std::filesystem::exists(kestod.socketPath()); }));
-    }
     void enable() const
     {
         support::writeFile(kestod.directory() / "configuration" / "feature-flags.toml", "[Sonalis]\nTracing = true\n");
@@ -69,7 +64,7 @@ TEST_F(TraceRecord, ShowsWhatAProgramEmitsAndPassesItsStatusOn)
     if (tracefs.problem())
         GTEST_SKIP() << *tracefs.problem();
     enable();
-    start();
+    kestod.startAndAwait();
     const std::string copy = path("copy.qdj");
     // Words as they are, whatever they look like to the tool.
     const Finished finished =
@@ -100,7 +95,7 @@ TEST_F(TraceRecord, ShowsWhatAProgramEmitsAndPassesItsStatusOn)
 
 TEST_F(TraceRecord, DoesNotRunTheProgramWhenTheServiceDoesNotTrace)
 {
-    start(); // the feature is off
+    kestod.startAndAwait(); // the feature is off
     expectNothingIsRun(record({}, {"touch", path("touched")}), "the service does not trace. Either the feature is off");
 }
 

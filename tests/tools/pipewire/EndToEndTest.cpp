@@ -265,14 +265,14 @@ TEST_F(EndToEndTest, ASessionsEndTellsWhatTheDevicesDid)
     ASSERT_TRUE(comes("kesto.Cavlet.Simple"));
     ASSERT_TRUE(comes("kesto.Cavlet.Histogram"));
 
-    const auto cycles = values("kesto.Cavlet.Simple", "pipewire_Tx_nullsink_Simple_cycles");
+    const auto cycles = values("kesto.Cavlet.Simple", "pipewire_Tx_null-sink_Simple_cycles");
     EXPECT_GT(std::stoi(cycles.at(0)), 20);
     EXPECT_EQ(values("kesto.Cavlet.Simple", "pipewire_Tx_Simple_cycles"), cycles);
-    EXPECT_THAT(values("kesto.Cavlet.Histogram", "pipewire_Tx_nullsink_Histogram_work"),
+    EXPECT_THAT(values("kesto.Cavlet.Histogram", "pipewire_Tx_null-sink_Histogram_work"),
                 ElementsAre(testing::HasSubstr("unit=us::")));
-    EXPECT_THAT(values("kesto.Cavlet.Histogram", "pipewire_StateTransitionTimesms_nullsink_Histogram_toRunning"),
+    EXPECT_THAT(values("kesto.Cavlet.Histogram", "pipewire_StateTransitionTimesms_null-sink_Histogram_toRunning"),
                 ElementsAre(testing::HasSubstr("unit=ms::")));
-    EXPECT_THAT(values("kesto.Cavlet.State", "pipewire_Speaker_nullsink_State_state"),
+    EXPECT_THAT(values("kesto.Cavlet.State", "pipewire_Speaker_null-sink_State_state"),
                 ElementsAre(testing::HasSubstr("name:Running,transition:1,")));
 }
 
