@@ -50,7 +50,7 @@ bool isKind(const ReportingChannel& channel, platform::ChannelFormat format)
     return channel.format == static_cast<std::uint8_t>(format);
 }
 
-std::string withUnit(std::string text, const ReportingChannel& channel)
+std::string withUnit(const std::string& text, const ReportingChannel& channel)
 {
     return channel.unit ? text + ' ' + *channel.unit : text;
 }
