@@ -181,7 +181,7 @@ void KestoReportingClientServerInstance::start(KestoReportingServiceDelegateProt
         earlier(std::nullopt, true);
     session->setTransactionCompleteBlock(reply);
     if (const auto features = delegate.getFeaturesState())
-        session->sendMessage(*features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
+        session->sendMessage(features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
     if (session->mayBeTraced())
         reply(std::nullopt, true);
     logActiveSessions(delegate);

@@ -171,6 +171,8 @@ private:
     // The line, from 1, says where to look.
     Value failAt(std::ptrdiff_t offset, PropertyListError error, std::string_view what)
     {
+        if (failed()) // of several failures the first counts, and only it is put into words
+            return {};
         const auto before = bytes_.substr(0, static_cast<std::size_t>(std::max<std::ptrdiff_t>(offset, 0)));
         return failWith(error, format("line {}: {}", 1 + std::ranges::count(before, '\n'), what));
     }

@@ -7,6 +7,8 @@
 #include "tracing/TraceRunner.h"
 #include "utility/KestoReportingUtility.h"
 
+#include <system_error>
+
 const foundation::String KestoReportingTraceTypeKtrace("ktrace");
 
 namespace {
@@ -17,7 +19,7 @@ constexpr std::string_view traceFileKey = "KestoReportingPellorinPlistFilePath";
 bool allowsKernelTrace(const foundation::Dictionary& configuration)
 {
     const foundation::Value* type = configuration.find(traceTypeKey);
-    if (type == nullptr)
+    if (type == nullptr || type->isNull())
         return true;
     const auto text = type->string();
     return text && text->isSameObject(KestoReportingTraceTypeKtrace);
@@ -40,7 +42,15 @@ void KestoReportingSession::setupTracing(const std::optional<std::string>& fileN
     }
     tracingFileName_ = fileName;
     traceParams_ = TraceParamsParser(*fileName).loadTraceParams();
-    traceRunner_ = std::make_unique<TraceRunner>();
+    try {
+        traceRunner_ = std::make_unique<TraceRunner>();
+    } catch (const std::system_error& error) { // no thread for its queue
+        tracingFileName_.reset();
+        traceParams_.reset();
+        KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} is not traced: {}", reporterID_,
+                  error.code().message());
+        return;
+    }
     traceRunner_->createTraceFromTraceParams(traceParams_.get());
     startedTracing_ = false;
     KESTO_LOG(KestoReportingSessionCategory(), Info, "Setting up tracing for {}", serviceName_);
@@ -48,11 +58,11 @@ void KestoReportingSession::setupTracing(const std::optional<std::string>& fileN
 
 void KestoReportingSession::startTracing()
 {
-    if (!mayBeTraced() || startedTracing_)
+    if (startedTracing_ || !mayBeTraced())
         return;
     const foundation::Dictionary configuration = this->configuration();
     const foundation::Value* file = configuration.find(traceFileKey);
-    if (!allowsKernelTrace(configuration) || file == nullptr)
+    if (!allowsKernelTrace(configuration) || file == nullptr || file->isNull())
         return;
     if (TraceRunner::numberOfRunners() >= TraceRunner::mostAtOnce) {
         KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} is not traced: {} others are", reporterID_,
@@ -61,13 +71,15 @@ void KestoReportingSession::startTracing()
     }
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "Got the tracefile {}, setting up trace", file->text());
     setupTracing(file->text());
+    if (!tracingFileName_)
+        return;
     startedTracing_ = true;
     traceRunner_->runTraces();
 }
 
 void KestoReportingSession::stopTracing()
 {
-    if (!mayBeTraced() || !startedTracing_ || !allowsKernelTrace(configuration()))
+    if (!startedTracing_ || !mayBeTraced() || !allowsKernelTrace(configuration()))
         return;
     startedTracing_ = false;
     traceRunner_->stopTracingandProcessResults();

@@ -6,14 +6,17 @@
 void Trace::processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events)
 {
     std::size_t results = 0;
+    std::size_t eventsRead = 0;
     std::size_t leftOut = 0;
     for (const auto& data : data_) {
-        if (results >= mostResults) {
+        const bool isTooMuch = eventsRead != 0 && eventsRead + events.size() > mostEventsRead;
+        if (results >= mostResults || isTooMuch) {
             ++leftOut;
             continue;
         }
         data->processTracepoints(session, events);
         results += data->getResults().size();
+        eventsRead += events.size();
     }
     if (leftOut != 0)
         KESTO_LOG(KestoReportingTraceCategory(), Error, "trace {} has {} results; {} of its intervals are left out",

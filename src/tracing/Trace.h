@@ -22,9 +22,11 @@ public:
     [[nodiscard]] const std::vector<std::unique_ptr<TraceData>>& data() const { return data_; }
 
     void addTraceDataToCollect(std::unique_ptr<TraceInterval> interval) { data_.push_back(std::move(interval)); }
-    // Lets each of them, in their order, read all events; those that are left when there are this many results do not,
-    // with a line that says how many.
+    // Lets each of them, in their order, read all events. Those that are left when there are so many results, or when
+    // all together have read so many events (a second or so of work, for which the service waits), do not, with a line
+    // that says how many; the first always does.
     static constexpr std::size_t mostResults = 1'000'000;
+    static constexpr std::size_t mostEventsRead = 50'000'000;
     void processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events);
     // Everything that was found. What one call has gathered stays: the next returns every value once more.
     [[nodiscard]] TraceResults getResults();

@@ -79,6 +79,9 @@ TEST(PropertyListErrors, NeitherForm)
 
 TEST(XmlPropertyListErrors, NotWellFormed)
 {
+    // Only the first of many is looked for from the beginning.
+    expectXmlFailure("<string>" + repeated("<a/>", 100'000) + "</string>", Malformed,
+                     "an element where only text can stand");
     expectXmlFailure("<dict></array>", Malformed, "not well-formed XML: Start-end tags mismatch");
     for (const std::string_view document :
          {"<plist><true/>", "<plist><true></plist>", "<plist><array></true></plist>", "<", "<plist", "<plist>&",

@@ -156,8 +156,17 @@ TEST_F(SessionTracing, DoesNotStartWithATraceTypeThatOnlyHasTheSameText)
 
 TEST_F(SessionTracing, DoesNotStartWithATraceTypeThatIsNoText)
 {
-    session->setConfiguration(Dictionary{{typeKey, Value()}});
+    session->setConfiguration(Dictionary{{typeKey, 7}});
     expectNoTraceIsStarted();
+}
+
+TEST_F(SessionTracing, TakesANullForNoValue)
+{
+    session->setConfiguration(Dictionary{{typeKey, Value()}, {fileKey, Value()}});
+    expectNoTraceIsStarted();
+    session->setConfiguration(Dictionary{{typeKey, Value()}, {fileKey, file}});
+    session->start();
+    EXPECT_TRUE(session->startedTracing());
 }
 
 TEST_F(SessionTracing, DoesNotStartWhileTheFeatureIsOff)

@@ -136,6 +136,18 @@ TEST_F(TraceTest, LeavesOutWhatItWouldMeasureBeyondAMillionResultsAndSaysSo)
                                             "trace startup has 1000000 results; 3 of its intervals are left out")));
 }
 
+TEST_F(TraceTest, LeavesOutIntervalsThatWouldReadMoreEventsThanTheServiceMayWaitFor)
+{
+    constexpr std::size_t count = 1'000'000;
+    constexpr std::size_t read = Trace::mostEventsRead / count;
+    for (std::size_t number = 0; number < read + 2; ++number)
+        add(std::to_string(number), 1, 2);
+    process(Events(count, eventOf(3, 1)));
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(support::IsLine(platform::LogLevel::Error, "kert",
+                                            "trace startup has 0 results; 2 of its intervals are left out")));
+}
+
 // --- the events of a trace
 
 void fill(TraceEvents& events, std::size_t count)

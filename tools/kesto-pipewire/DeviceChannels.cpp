@@ -2,6 +2,7 @@
 #include "kesto-pipewire/DeviceChannels.h"
 
 #include <algorithm>
+#include <chrono>
 #include <cmath>
 #include <utility>
 #include <vector>
@@ -39,6 +40,7 @@ DeviceChannels::DeviceChannels(std::string root, const Diagnostics& diagnostics)
 {
     kesto::PublisherOptions options;
     options.root = std::move(root);
+    options.refreshInterval = std::chrono::milliseconds::max(); // `flush` tells how long states have lasted
     auto status = publisher_.open(options);
     if (status == kesto::Status::Ok)
         status = createTotals();
@@ -113,8 +115,10 @@ void DeviceChannels::deviceStateChanged(DeviceSerial serial, DeviceState state, 
         constexpr double millisecondsASecond = 1000;
         const auto wanted = std::exchange(device->wantedSince, std::nullopt);
         const auto milliseconds = std::llround((when.uptime - wanted->uptime) * millisecondsASecond);
-        device->startTimes.record(milliseconds);
-        startTimes_.record(milliseconds);
+        if (milliseconds <= startBounds.back()) { // longer waits are those of somebody who has paused
+            device->startTimes.record(milliseconds);
+            startTimes_.record(milliseconds);
+        }
     }
     countRunning();
 }

@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <set>
+#include <utility>
 
 namespace kesto_pipewire {
 
@@ -104,14 +105,19 @@ void Graph::removeNode(ObjectID id, Moment when)
     std::erase_if(links_, [id](const auto& link) { return link.second.touches(id); });
 }
 
+void Graph::endStreams(Moment when)
+{
+    for (auto& [id, node] : nodes_)
+        if (std::exchange(node.hasAppeared, false))
+            listener_.gone(node.serial, when);
+}
+
 void Graph::clear(Moment when)
 {
-    for (const auto& [id, node] : nodes_) {
-        if (node.hasAppeared)
-            listener_.gone(node.serial, when);
+    endStreams(when); // before the devices, whose statistics belong to the streams' sessions
+    for (const auto& [id, node] : nodes_)
         if (node.isDevice)
             deviceListener_.deviceGone(node.serial);
-    }
     nodes_.clear();
     links_.clear();
     clients_.clear();

@@ -51,6 +51,8 @@ public:
     void addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Moment when);
     // An object of any kind is gone.
     void remove(ObjectID object, Moment when);
+    // Every stream counts as gone; the devices stay.
+    void endStreams(Moment when);
     // The server is gone, and everything with it.
     void clear(Moment when);
 

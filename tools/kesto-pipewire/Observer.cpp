@@ -77,7 +77,7 @@ void Observer::stop()
     loop_.disarm(retry_);
     socketWatch_.reset();
     connection_.reset();
-    graph_.clear(currentMoment());
+    graph_.endStreams(currentMoment());
     if (const auto ignored = graph_.ignoredObjects())
         diagnostics_.say("{} of PipeWire's objects were left aside, being too many at once", ignored);
 }

@@ -26,7 +26,8 @@ const spa_pod* findProperty(const spa_pod& object, std::uint32_t key)
         return nullptr;
     std::uint32_t count = 0;
     std::uint32_t choice = 0;
-    return spa_pod_get_values(&property->value, &count, &choice); // formats hold choices of one value
+    const auto* values = spa_pod_get_values(&property->value, &count, &choice); // formats hold choices of one value
+    return count > 0 ? values : nullptr;
 }
 
 std::optional<float> readFloat(const spa_pod& object, std::uint32_t key)
@@ -54,7 +55,8 @@ std::optional<float> readLoudestChannel(const spa_pod& properties)
 {
     std::array<float, SPA_AUDIO_MAX_CHANNELS> amplitudes{};
     const auto* pod = findProperty(properties, SPA_PROP_channelVolumes);
-    if (!pod || !spa_pod_is_array(pod))
+    // Copying trusts what the array says of its elements' size.
+    if (!pod || !spa_pod_is_array(pod) || SPA_POD_ARRAY_VALUE_SIZE(pod) != sizeof(float))
         return std::nullopt;
     const auto count = spa_pod_copy_array(pod, SPA_TYPE_Float, amplitudes.data(), amplitudes.size());
     if (count == 0)

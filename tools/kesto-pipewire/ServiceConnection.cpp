@@ -86,7 +86,8 @@ void ServiceConnection::handleState()
         diagnostics_.say("connected to the reporting service");
         saidThatItIsAway_ = false;
         handlers_.lost();
-        handlers_.appeared();
+        if (isConnected_)
+            handlers_.appeared();
     }
     if (isConnected_)
         return;

@@ -40,6 +40,9 @@ struct Listener {
         subscription->queue = queue;
         subscription->startTime = start;
     }
+    ~Listener() { queue->run(); } // what it holds holds the queue
+    Listener(const Listener&) = delete;
+    Listener& operator=(const Listener&) = delete;
     void end(std::uint64_t time) const { subscription->endTime = time; }
 
     std::shared_ptr<HeldQueue> queue = std::make_shared<HeldQueue>();

@@ -88,7 +88,8 @@ RC_GTEST_PROP(TraceHistogramOf, AnyValuesHasEachOfThemInOneRow, ())
         const HistogramRow& row = rows[index];
         const bool isLast = index + 1 == rows.size();
         RC_ASSERT(row.lower <= row.upper);
-        RC_ASSERT(isLast || row.upper == rows[index + 1].lower);
+        if (!isLast)
+            RC_ASSERT(row.upper == rows[index + 1].lower);
         RC_ASSERT(static_cast<std::ptrdiff_t>(row.count) == std::ranges::count_if(values, [&](double value) {
                       return value >= row.lower && (value < row.upper || (isLast && value == row.upper));
                   }));

@@ -121,6 +121,14 @@ TEST_F(DeviceChannelsTest, WhoRunsAlreadyOrIsNotWantedAnyMoreHasNoTimeToRun)
     EXPECT_THAT(file("StateTransitionTimes_ms/speaker/to Running"), testing::Not(HasSubstr(" 1\n")));
 }
 
+TEST_F(DeviceChannelsTest, WhoWasPausedForLongTookNoTimeToRun)
+{
+    channels.deviceWanted(sink, true, now);
+    channels.deviceStateChanged(sink, DeviceState::Running, {1010.5, 20.5});
+
+    EXPECT_THAT(file("StateTransitionTimes_ms/speaker/to Running"), testing::Not(HasSubstr(" 1\n")));
+}
+
 TEST_F(DeviceChannelsTest, WhatIsSaidOfUnknownDevicesIsIgnored)
 {
     channels.deviceCycle(99, {});

@@ -265,6 +265,19 @@ TEST_F(GraphTest, WhenTheServerGoesEveryStreamGoes)
     EXPECT_THAT(listener.news(), IsEmpty());
 }
 
+TEST_F(GraphTest, StreamsEndOnceAndBeforeTheDevices)
+{
+    addStream(node, 500);
+    devices.news();
+    graph.endStreams(now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 gone"));
+    EXPECT_THAT(devices.news(), IsEmpty());
+    graph.clear(now);
+
+    EXPECT_THAT(listener.news(), IsEmpty());
+    EXPECT_THAT(devices.news(), ElementsAre("30 gone"));
+}
+
 TEST_F(GraphTest, StreamsBeyondTheLimitAreLeftAsideAndCounted)
 {
     for (ObjectID id = 0; id < maximumStreams; ++id)

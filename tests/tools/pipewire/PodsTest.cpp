@@ -148,6 +148,21 @@ TEST(ReadVolumeTest, TheLoudestChannelCounts)
               0.5);
 }
 
+TEST(ReadVolumeTest, AnArrayThatLiesAboutItsElementsIsNone)
+{
+    const std::vector<float> large(1024);
+    std::array<std::uint8_t, 8192> bytes{};
+    spa_pod_builder builder{};
+    spa_pod_builder_init(&builder, bytes.data(), bytes.size());
+    spa_pod_frame frame{};
+    spa_pod_builder_push_object(&builder, &frame, SPA_TYPE_OBJECT_Props, 0);
+    spa_pod_builder_prop(&builder, SPA_PROP_channelVolumes, 0);
+    spa_pod_builder_array(&builder, 2048, SPA_TYPE_Float, 2, large.data());
+    spa_pod_builder_pop(&builder, &frame);
+
+    EXPECT_EQ(readVolume(*reinterpret_cast<const spa_pod*>(bytes.data())), std::nullopt);
+}
+
 TEST(ReadVolumeTest, TheVolumeOfTheWholeIsAFactor)
 {
     EXPECT_EQ(readVolume(PodBuilder()
