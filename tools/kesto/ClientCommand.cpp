@@ -161,12 +161,14 @@ private:
     // On the library's thread, as what follows.
     void print(const kesto::Answer& answer)
     {
+        if (answer.status() == kesto::Status::ConnectionLost)
+            return; // no answer of the service's; that the connection is over is told behind it
         const std::scoped_lock lock(lock_);
         if (answer.operation() != kesto::Operation::StartSession && unanswered_ > 0)
             --unanswered_;
         changed_.notify_all();
-        if (isFinished_ || answer.status() == kesto::Status::ConnectionLost)
-            return; // not the service's answers
+        if (isFinished_)
+            return;
         const std::string line = lineOf(answer) + '\n';
         std::fwrite(line.data(), 1, line.size(), stdout); // what cannot be written is told at the end
         std::fflush(stdout);
