@@ -120,7 +120,8 @@ int play(const char* role, const char* name)
 } // namespace
 
 #ifdef __SANITIZE_ADDRESS__
-// Looking for leaks at the program's end now and then waits for ever for a thread of PipeWire's library that is just ending.
+// Looking for leaks at the program's end now and then waits for ever for a thread of PipeWire's library that is just
+// ending.
 extern "C" int __lsan_is_turned_off() // NOLINT(bugprone-reserved-identifier): the sanitizer's name
 {
     return 1;
