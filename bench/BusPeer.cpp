@@ -1,3 +1,5 @@
+// Both ends as sd-bus makes them, and what a raw client needs to stand in for one: the bytes of a call, taken off the
+// wire, and how long an answer is.
 #include "BusPeer.h"
 
 #include "SampleMessage.h"

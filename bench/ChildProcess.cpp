@@ -1,3 +1,4 @@
+// A child dies with its parent, by the kernel's word; what it cost stands in /proc.
 #include "ChildProcess.h"
 
 #include <algorithm>

@@ -1,3 +1,4 @@
+// It is there when its socket answers: nothing it says is waited for.
 #include "DaemonPeer.h"
 
 #include "Harness.h"

@@ -1,3 +1,4 @@
+// One round a turn: whatever the machine does meanwhile, it does to every contestant.
 #include "Harness.h"
 
 #include <algorithm>

@@ -1,3 +1,5 @@
+// Whoever enters a namespace stays in it, so journald and whoever measures it live in a child, and a socket carries
+// requests and figures across.
 #include "JournalPeer.h"
 
 #include "Harness.h"

@@ -1,3 +1,5 @@
+// Requests are one string in which only the number changes, answers a count of bytes: as little as possible is left of
+// the client in what is measured.
 #include "RawClient.h"
 
 #include "SampleMessage.h"

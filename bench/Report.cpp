@@ -1,3 +1,4 @@
+// Rows become text and JSON only at the end, when the columns' widths are known.
 #include "Report.h"
 
 #include <algorithm>

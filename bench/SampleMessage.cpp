@@ -1,3 +1,4 @@
+// Each kind of value that players send is in it.
 #include "SampleMessage.h"
 
 namespace bench {

@@ -1,3 +1,4 @@
+// Clients connect as soon as the socket is there, and speak the protocol as it stands on the wire.
 #include "ServiceProcess.h"
 
 #include "SampleMessage.h"

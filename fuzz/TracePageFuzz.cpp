@@ -13,7 +13,6 @@
 
 namespace {
 
-using platform::KernelTraceEvent;
 using Page = std::vector<std::byte>;
 
 void require(bool holds)
@@ -49,7 +48,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     std::uint64_t last = 0;
     std::size_t events = 0;
     const auto takeUpTo = [&](std::uint64_t time) {
-        for (const KernelTraceEvent& event : merger.eventsUpTo(time)) {
+        for (const platform::TracedMarker& event : merger.eventsUpTo(time)) {
             require(event.timestamp >= last && event.timestamp <= time);
             last = event.timestamp;
             ++events;

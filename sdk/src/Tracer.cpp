@@ -1,3 +1,4 @@
+// What can fail is done before anything is exchanged; the exchange itself is one call of the kernel's.
 #include "Tracer.h"
 
 #include "platform/linux/TraceMarker.h"

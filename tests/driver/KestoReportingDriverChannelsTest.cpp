@@ -2,7 +2,7 @@
 // everything that files may do in between.
 #include "driver/KestoReportingDriverUtility.h"
 #include "platform/linux/LinuxReportingChannels.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "foundation/Value.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <chrono>
 #include <expected>

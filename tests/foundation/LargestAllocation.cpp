@@ -1,3 +1,4 @@
+// The program's own operator new sees every request, and remembers the largest.
 #include "foundation/LargestAllocation.h"
 
 #include <algorithm>

@@ -1,3 +1,5 @@
+// Local time where people live: zones with odd offsets, summer and winter, a device that travels, and moments that no
+// calendar has room for.
 #include "foundation/LocalTime.h"
 
 #include <cstdlib>

@@ -1,3 +1,5 @@
+// Text that grows piece by piece: held against plain concatenation, at its beginning, its end and everywhere memory is
+// asked for anew.
 #include "foundation/StringBuilder.h"
 
 #include "foundation/Value.h"

@@ -1,3 +1,4 @@
+// The program's own operator new counts, a count a thread, so that other threads do not disturb it.
 #include "sdk/Allocations.h"
 
 #include <cstdlib>

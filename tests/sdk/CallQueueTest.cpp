@@ -1,3 +1,5 @@
+// The queue between a program's threads and the connection's: order, room and limits, against a model, and from many
+// threads at once.
 #include "CallQueue.h"
 
 #include <deque>

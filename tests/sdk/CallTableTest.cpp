@@ -1,3 +1,4 @@
+// Which answer is whose: calls that are answered once, twice, late or never, and what no honest service would answer.
 #include "CallTable.h"
 
 #include <gmock/gmock.h>

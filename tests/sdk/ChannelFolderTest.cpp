@@ -1,7 +1,7 @@
 // Where channels are published when nobody says so.
 #include "ChannelFolder.h"
 
-#include "sdk/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cstdlib>
 #include <filesystem>
@@ -44,7 +44,7 @@ TEST(ChannelRoot, IsTheOneOfTheEnvironment)
 
 TEST(ChannelRoot, IsThatOfTheUsersServiceWhereThereIsOne)
 {
-    const sdk_test::TemporaryDirectory runtime;
+    const support::TemporaryDirectory runtime;
     const Variable root("KESTO_CHANNEL_ROOT", "");
     const Variable directory("XDG_RUNTIME_DIR", runtime.path().string());
     EXPECT_EQ(libkesto::usualChannelRoot(), "/run/kesto/channels") << "no service of the user's";

@@ -2,7 +2,7 @@
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"
-#include "sdk/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -52,7 +52,7 @@ protected:
         ASSERT_EQ(client_.open(options()), Status::Ok);
     }
 
-    sdk_test::TemporaryDirectory directory_;
+    support::TemporaryDirectory directory_;
     const std::string path_ = directory_ / "service";
     std::optional<FakeService> service_;
     Answers answers_;

@@ -2,7 +2,7 @@
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"
-#include "sdk/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -46,7 +46,7 @@ protected:
         return client_.send(message, Category::Playback, EventType::Start, 42, std::move(callback));
     }
 
-    sdk_test::TemporaryDirectory directory_;
+    support::TemporaryDirectory directory_;
     const std::string path_ = directory_ / "service";
     std::optional<FakeService> service_;
     Answers answers_;
@@ -298,7 +298,7 @@ RC_GTEST_PROP(HostileService, NeverHurtsItsClientWhateverItSends, ())
 {
     const auto noise = *rc::gen::container<std::string>(rc::gen::arbitrary<char>());
     const bool asFrame = *rc::gen::arbitrary<bool>();
-    const sdk_test::TemporaryDirectory directory;
+    const support::TemporaryDirectory directory;
     FakeService service(directory / "service", [&](Peer& peer, const Array&) {
         asFrame ? peer.sendFrame(noise) : peer.sendBytes(noise);
         peer.close();

@@ -3,7 +3,7 @@
 #include "kesto/kesto.h"
 #include "sdk/FakeService.h"
 #include "sdk/Process.h"
-#include "sdk/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <filesystem>
 #include <fstream>
@@ -37,7 +37,7 @@ protected:
     // Installs the library once for all of these tests, and moves what was installed: it has to be found where it is.
     static void SetUpTestSuite()
     {
-        directory_ = std::make_unique<sdk_test::TemporaryDirectory>();
+        directory_ = std::make_unique<support::TemporaryDirectory>();
         const std::string first = *directory_ / "first";
         const Finished installed = run({KESTO_CMAKE, "--install", buildDirectory + "/sdk", "--prefix", first});
         ASSERT_EQ(installed.status, 0) << installed.output << installed.errors;
@@ -71,10 +71,10 @@ protected:
     // Runs a player against a service, which must be told the whole story.
     static void expectReports(const std::string& program)
     {
-        const sdk_test::TemporaryDirectory runtime;
+        const support::TemporaryDirectory runtime;
         FakeService service(runtime / "service");
         const Finished played =
-            run({program}, {}, {"KESTO_SOCKET=" + (runtime / "service"), "LD_LIBRARY_PATH=" + library()});
+            run({program}, {}, {"KESTO_SOCKET=" + (runtime / "service").string(), "LD_LIBRARY_PATH=" + library()});
         EXPECT_EQ(played.status, 0) << played.errors;
         EXPECT_EQ(played.errors, "");
         EXPECT_EQ(played.output, "the session's run has ended\n2 messages answered, 0 lost\n");
@@ -91,7 +91,7 @@ protected:
     // Runs a driver helper, whose channels must be there as long as it runs.
     static void expectPublishes(const std::string& program)
     {
-        const sdk_test::TemporaryDirectory runtime;
+        const support::TemporaryDirectory runtime;
         const std::string tree = runtime / "channels";
         Process helper({program}, {"KESTO_CHANNEL_ROOT=" + tree, "LD_LIBRARY_PATH=" + library()});
         EXPECT_EQ(helper.waitForOutput("\n"), "published; press return to take it away\n");
@@ -111,7 +111,7 @@ protected:
         return text.str();
     }
 
-    static inline std::unique_ptr<sdk_test::TemporaryDirectory> directory_;
+    static inline std::unique_ptr<support::TemporaryDirectory> directory_;
 };
 
 TEST_F(ExamplesTest, PkgConfigFindsTheLibraryWhereItWasMovedTo)

@@ -1,3 +1,5 @@
+// A thread collects all that the program says, so that it never waits for its reader, and a process descriptor tells
+// its end.
 #include "sdk/Process.h"
 
 #include "sdk/FakeService.h"

@@ -3,7 +3,7 @@
 #include "platform/linux/ChannelTree.h"
 #include "sdk/Allocations.h"
 #include "sdk/Process.h"
-#include "sdk/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cerrno>
 #include <chrono>
@@ -64,7 +64,7 @@ protected:
         return status.st_mode & 07777U;
     }
 
-    const sdk_test::TemporaryDirectory directory;
+    const support::TemporaryDirectory directory;
     const std::string root = directory / "channels";
     kesto::Publisher publisher;
 };

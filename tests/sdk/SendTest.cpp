@@ -3,7 +3,7 @@
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"
-#include "sdk/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <array>
 #include <atomic>
@@ -66,7 +66,7 @@ protected:
         }
     }
 
-    sdk_test::TemporaryDirectory directory_;
+    support::TemporaryDirectory directory_;
     const std::string path_ = directory_ / "service";
     std::optional<FakeService> service_;
     Answers answers_;
@@ -372,7 +372,7 @@ protected:
         return status;
     }
 
-    sdk_test::TemporaryDirectory directory_;
+    support::TemporaryDirectory directory_;
     const std::string path_ = directory_ / "service";
     std::optional<FakeService> service_;
 };

@@ -1,3 +1,5 @@
+// Where a client looks for the service: what it was told comes before the environment, and that before the places that
+// the service has as packaged.
 #include "ServicePath.h"
 
 #include <cstdlib>

@@ -6,7 +6,7 @@
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"
-#include "sdk/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <array>
 #include <atomic>
@@ -109,7 +109,7 @@ protected:
     platform::TraceDescriptors descriptors;
     std::vector<int> attached;
     std::atomic<int> requests = 0;
-    sdk_test::TemporaryDirectory directory;
+    support::TemporaryDirectory directory;
     const std::string path = directory / "service";
     std::optional<FakeService> service;
     sdk_test::States states;

@@ -3,7 +3,7 @@
 
 #include "foundation/PropertyListWriter.h"
 #include "platform/linux/LinuxFileSystem.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
 
 #include <fcntl.h>

@@ -1,3 +1,4 @@
+// A class for each kind of object that is bound: its listener decodes what is heard and hands it to the graph.
 #include "kesto-pipewire/Connection.h"
 
 #include "kesto-pipewire/Pods.h"

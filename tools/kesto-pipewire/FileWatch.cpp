@@ -1,3 +1,4 @@
+// The folder is watched, as a file that is not there yet cannot be.
 #include "kesto-pipewire/FileWatch.h"
 
 #include <sys/inotify.h>

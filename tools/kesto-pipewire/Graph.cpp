@@ -1,3 +1,5 @@
+// Nodes, links and clients by their IDs. What is told of a stream or a device is worked out from the links anew each
+// time: there are few, and nothing can get out of step.
 #include "kesto-pipewire/Graph.h"
 
 #include "kesto-pipewire/Text.h"

@@ -1,3 +1,5 @@
+// PipeWire's loop calls back with a pointer. What that points to lives until the callback has returned, though the
+// callback may let go of its own source.
 #include "kesto-pipewire/Loop.h"
 
 #include <pipewire/loop.h>

@@ -1,3 +1,5 @@
+// A server that goes is noticed inside a callback of its connection, which cannot be taken down from there: so the loss
+// is noted with its time, and dealt with in the loop's next turn.
 #include "kesto-pipewire/Observer.h"
 
 #include <pipewire/context.h>

@@ -1,3 +1,5 @@
+// What a pod claims of its type, its size and its number of elements is looked at before anything is taken from it:
+// clients of PipeWire write these.
 #include "kesto-pipewire/Pods.h"
 
 #include <spa/debug/types.h>

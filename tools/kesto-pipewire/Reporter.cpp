@@ -1,3 +1,5 @@
+// Three steps, and none knows the others: what is heard is noted as pending, what is pending is found due or not, and
+// what is due is told in the order in which it happened.
 #include "kesto-pipewire/Reporter.h"
 
 #include <algorithm>

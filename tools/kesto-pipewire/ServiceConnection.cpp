@@ -1,3 +1,4 @@
+// libkesto's callbacks come on its own thread: they leave word of the state, and the loop's next turn reads it.
 #include "kesto-pipewire/ServiceConnection.h"
 
 #include "utility/KestoReportingVocabulary.h"

@@ -1,3 +1,5 @@
+// Cut first, between characters, and then looked at: a character that the cut had halved would make all of the text
+// foreign.
 #include "kesto-pipewire/Text.h"
 
 #include "foundation/String.h"

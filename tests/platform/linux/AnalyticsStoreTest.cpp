@@ -5,8 +5,8 @@
 #include "platform/linux/LinuxWorkQueues.h"
 #include "platform/linux/ManualClock.h"
 #include "platform/linux/StoreReader.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeLog.h"
+#include "support/TemporaryDirectory.h"
 
 #include <atomic>
 #include <chrono>

@@ -1,7 +1,7 @@
 // The captures on a real disk: whole or not at all, never more than allowed, and never through a link.
 #include "platform/linux/BugCaptureFolder.h"
 
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <algorithm>
 #include <array>

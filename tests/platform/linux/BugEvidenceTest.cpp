@@ -3,7 +3,7 @@
 #include "platform/linux/BugEvidence.h"
 
 #include "platform/linux/LinuxProcessTable.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <sys/stat.h>

@@ -1,7 +1,7 @@
 // The channel tree as it is meant, and as somebody hostile would have it.
 #include "platform/linux/ChannelTree.h"
 #include "platform/linux/ChannelFile.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>

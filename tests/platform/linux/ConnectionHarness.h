@@ -8,7 +8,7 @@
 #include "platform/linux/FrameReader.h"
 #include "platform/linux/LinuxConnectionListener.h"
 #include "platform/linux/LinuxWorkQueues.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
 
 #include <chrono>

@@ -4,8 +4,8 @@
 
 #include "platform/linux/ManualClock.h"
 #include "platform/linux/StoreReader.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeLog.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cerrno>
 #include <csignal>

@@ -1,7 +1,7 @@
 // Files by their names in an open folder: links, pipes and folders in their places.
 #include "platform/linux/FilesAt.h"
 
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>

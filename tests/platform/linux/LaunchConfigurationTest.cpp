@@ -2,7 +2,7 @@
 #include "platform/linux/LaunchConfiguration.h"
 
 #include "platform/linux/ServiceManager.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <array>
 #include <cstdlib>

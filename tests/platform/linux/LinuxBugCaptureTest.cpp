@@ -2,10 +2,10 @@
 #include "platform/linux/LinuxBugCapture.h"
 
 #include "platform/linux/LinuxLog.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeClock.h"
 #include "support/FakeWorkQueues.h"
 #include "support/ParseJson.h"
+#include "support/TemporaryDirectory.h"
 
 #include <algorithm>
 #include <gmock/gmock.h>

@@ -1,6 +1,6 @@
 // Folders and files on the real file system: permissions, links that others put there, and disks that are full.
 #include "platform/linux/LinuxFileSystem.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <array>
 #include <csignal>

@@ -3,7 +3,7 @@
 #include "platform/linux/LinuxLog.h"
 
 #include "platform/linux/ProviderLog.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <array>
 #include <cerrno>

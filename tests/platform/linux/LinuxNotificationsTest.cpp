@@ -2,8 +2,8 @@
 #include "platform/linux/LinuxNotifications.h"
 
 #include "platform/linux/LinuxWorkQueues.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeLog.h"
+#include "support/TemporaryDirectory.h"
 
 #include <condition_variable>
 #include <fcntl.h>

@@ -1,9 +1,9 @@
 // Performance data: what a file holds, when it takes its place, and what is said when it cannot.
 #include "platform/linux/LinuxPerformanceWriter.h"
 #include "platform/linux/LinuxFileSystem.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeFiles.h"
 #include "support/FakeLog.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <limits>

@@ -2,7 +2,7 @@
 #include "platform/linux/LinuxPlatform.h"
 
 #include "platform/linux/StoreReader.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <future>
 #include <gtest/gtest.h>

@@ -4,9 +4,9 @@
 
 #include "platform/linux/LinuxDeviceProperties.h"
 #include "platform/linux/LinuxFeatureFlags.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeLog.h"
 #include "support/Sanitizers.h"
+#include "support/TemporaryDirectory.h"
 
 #include <chrono>
 #include <condition_variable>

@@ -3,7 +3,7 @@
 
 #include "foundation/String.h"
 #include "platform/linux/LinuxClock.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <csignal>
 #include <gtest/gtest.h>

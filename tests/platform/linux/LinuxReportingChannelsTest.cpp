@@ -1,8 +1,8 @@
 // The reporting channels of this system: what is published and what the kernel tells, found, sampled and compared as
 // the service does it.
 #include "platform/linux/LinuxReportingChannels.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeLog.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <map>

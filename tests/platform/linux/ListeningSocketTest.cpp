@@ -1,7 +1,7 @@
 // Sockets that are bound where others were or are, and sockets that are passed.
 #include "platform/linux/ListeningSocket.h"
 
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cstdlib>
 #include <fcntl.h>

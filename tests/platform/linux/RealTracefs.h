@@ -2,7 +2,7 @@
 // own, so that it is gone with it.
 #pragma once
 
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cerrno>
 #include <cstring>

@@ -1,6 +1,6 @@
 // What the kernel tells about sound cards, read from trees recorded on cards of several kinds.
 #include "platform/linux/SoundCards.h"
-#include "platform/linux/TemporaryDirectory.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <map>

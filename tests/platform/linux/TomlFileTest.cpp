@@ -1,8 +1,8 @@
 // TOML as values, and files that are broken for a while.
 #include "platform/linux/TomlFile.h"
 
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeLog.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

@@ -2,8 +2,8 @@
 #pragma once
 
 #include "platform/linux/FileDescriptor.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "platform/linux/TraceMarker.h"
+#include "support/TemporaryDirectory.h"
 
 #include <array>
 #include <cstddef>

@@ -1,8 +1,8 @@
 // The tool as it is shipped, in an environment of its own that names the directories of one service.
 #pragma once
 
-#include "platform/linux/TemporaryDirectory.h"
 #include "sdk/Process.h"
+#include "support/TemporaryDirectory.h"
 
 #include <filesystem>
 #include <memory>

@@ -3,8 +3,8 @@
 
 #include "platform/linux/LinuxFileSystem.h"
 #include "platform/linux/LinuxPerformanceWriter.h"
-#include "platform/linux/TemporaryDirectory.h"
 #include "support/FakeLog.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cmath>
 #include <gmock/gmock.h>

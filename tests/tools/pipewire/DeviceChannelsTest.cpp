@@ -1,6 +1,7 @@
 // The channels of devices, as their files show them.
 
 #include "kesto-pipewire/DeviceChannels.h"
+#include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -28,7 +29,6 @@ protected:
         channels.deviceAppeared(sink, {Direction::Output, "speaker"});
         channels.deviceAppeared(source, {Direction::Input, "microphone"});
     }
-    ~DeviceChannelsTest() override { std::filesystem::remove_all(root); }
 
     // The text of a channel's file, once it shows what is so now.
     [[nodiscard]] std::string file(const std::string& path)
@@ -40,13 +40,8 @@ protected:
         return stream ? text.str() : "no file";
     }
 
-    static std::filesystem::path makeRoot()
-    {
-        auto name = (std::filesystem::temp_directory_path() / "kesto-channels-XXXXXX").string();
-        return ::mkdtemp(name.data());
-    }
-
-    const std::filesystem::path root = makeRoot();
+    const support::TemporaryDirectory directory;
+    const std::filesystem::path& root = directory.path();
     const Diagnostics diagnostics{false};
     DeviceChannels channels{root, diagnostics};
     const Moment now{1000, 10};

@@ -1,6 +1,7 @@
 // The whole road: a sound that is really played on a real PipeWire, the program as it is shipped, a real service,
 // and the events that it stored.
 
+#include "support/TemporaryDirectory.h"
 #include "tools/pipewire/HeadlessPipeWire.h"
 
 #include <gmock/gmock.h>
@@ -31,17 +32,9 @@ class EndToEndTest : public testing::Test {
 protected:
     EndToEndTest()
     {
-        auto name = (std::filesystem::temp_directory_path() / "kesto-end-to-end-XXXXXX").string();
-        directory = ::mkdtemp(name.data());
         for (const auto* folder : {"run", "state", "logs", "config"})
             std::filesystem::create_directory(directory / folder);
         std::ofstream(directory / "config/device.toml") << "InternalBuild = true\n";
-    }
-    ~EndToEndTest() override
-    {
-        reporter.reset();
-        service.reset();
-        std::filesystem::remove_all(directory);
     }
     void SetUp() override
     {
@@ -130,7 +123,7 @@ protected:
     static void letItPlay(std::chrono::milliseconds duration) { std::this_thread::sleep_for(duration); }
 
     HeadlessPipeWire server;
-    std::filesystem::path directory;
+    const support::TemporaryDirectory directory;
     std::unique_ptr<Program> service;
     std::unique_ptr<Program> reporter;
 };

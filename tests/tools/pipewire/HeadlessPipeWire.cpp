@@ -1,3 +1,4 @@
+// The script that people start a private PipeWire with does the work; here it is only held on a leash.
 #include "tools/pipewire/HeadlessPipeWire.h"
 
 #include <gtest/gtest.h>
@@ -135,25 +136,22 @@ int Program::wait()
 
 HeadlessPipeWire::HeadlessPipeWire()
 {
-    std::string name = (std::filesystem::temp_directory_path() / "kesto-pipewire-XXXXXX").string();
-    directory_ = ::mkdtemp(name.data());
     start();
 }
 
 HeadlessPipeWire::~HeadlessPipeWire()
 {
     clearAway();
-    std::error_code ignored;
-    std::filesystem::remove_all(directory_, ignored);
 }
 
 // The script runs a shell that says that all is up and then lasts as long as its standard input, so that nothing
 // is left behind however the test ends.
 void HeadlessPipeWire::start()
 {
-    instance_ = std::make_unique<Program>(std::vector<std::string>{HEADLESS_PIPEWIRE, "--in", directory_, "sh", "-c",
-                                                                   "echo $HEADLESS_PIPEWIRE_PID; exec cat >/dev/null"},
-                                          Program::Environment{});
+    instance_ =
+        std::make_unique<Program>(std::vector<std::string>{HEADLESS_PIPEWIRE, "--in", directory_.path(), "sh", "-c",
+                                                           "echo $HEADLESS_PIPEWIRE_PID; exec cat >/dev/null"},
+                                  Program::Environment{});
     const auto line = instance_->readLine();
     if (!line.empty()) {
         server_ = std::stoi(line);
@@ -187,7 +185,7 @@ std::string HeadlessPipeWire::socket() const
 
 Program::Environment HeadlessPipeWire::environment() const
 {
-    return {{"HOME", directory_},
+    return {{"HOME", directory_.path()},
             {"XDG_RUNTIME_DIR", directory_ / "run"},
             {"XDG_CONFIG_HOME", directory_ / "config"},
             {"PIPEWIRE_REMOTE", socket()},

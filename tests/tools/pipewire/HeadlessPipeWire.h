@@ -1,9 +1,10 @@
 // A real PipeWire of a test's own, and programs that play and record on it.
 #pragma once
 
+#include "support/TemporaryDirectory.h"
+
 #include <sys/types.h>
 
-#include <filesystem>
 #include <map>
 #include <memory>
 #include <string>
@@ -68,7 +69,7 @@ public:
     [[nodiscard]] std::string onlySinkInput() const;
 
 private:
-    std::filesystem::path directory_;
+    const support::TemporaryDirectory directory_;
     std::unique_ptr<Program> instance_;
     pid_t server_ = -1;
     std::string reasonToSkip_;

@@ -29,6 +29,7 @@ public:
     TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
 
     [[nodiscard]] const std::filesystem::path& path() const noexcept { return path_; }
+    [[nodiscard]] std::filesystem::path operator/(std::string_view name) const { return path_ / name; }
 
 private:
     std::filesystem::path path_;
