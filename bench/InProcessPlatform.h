@@ -133,6 +133,7 @@ private:
         {
             return std::unexpected(std::make_error_code(std::errc::permission_denied));
         }
+        void keepWithin(const std::filesystem::path&, const platform::KeptFiles&, std::uint64_t) override { }
         [[nodiscard]] std::expected<std::string, std::error_code> readFile(const std::filesystem::path&,
                                                                            std::size_t) override
         {

@@ -2,6 +2,8 @@
 // those that clients name.
 #pragma once
 
+#include <cstddef>
+#include <cstdint>
 #include <expected>
 #include <filesystem>
 #include <memory>
@@ -23,6 +25,13 @@ public:
     [[nodiscard]] virtual std::expected<void, std::error_code> commit() = 0;
 };
 
+// Files of one kind, and how many of them a folder may hold. Beyond that the oldest go, but never the newest.
+struct KeptFiles {
+    std::size_t most;
+    std::uint64_t mostBytes; // of all together
+    bool (*isOne)(std::string_view name); // of a file name, whoever chose it. Any thread
+};
+
 // Any thread. What is written lies below the diagnostic-log root; other paths are errors.
 class FileSystem {
 public:
@@ -35,6 +44,9 @@ public:
                                                                                  unsigned permissions) = 0;
     [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) = 0;
+    // Tells that a file of that kind, of so many bytes, has come into the folder: if there are too many now, the oldest
+    // are removed in the background. Does not look into the folder itself.
+    virtual void keepWithin(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes) = 0;
     // The bytes of a file anywhere, whoever named it. Does not wait, and takes no more memory than the limit (bytes):
     // `errc::file_too_large` when the file is longer, `errc::invalid_argument` when the path is no regular file's.
     [[nodiscard]] virtual std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,

@@ -106,6 +106,10 @@ public:
                          double minimumPlaytime);
     static constexpr std::size_t mostVolumeEventBytes = std::size_t{64} << 20;
 
+    // Summary files of all sessions that are kept; beyond these the oldest go.
+    static constexpr std::size_t mostSummaryFiles = 4096;
+    static constexpr std::uint64_t mostSummaryBytes = std::uint64_t{256} << 20; // of all together
+
     // For every key of this run's messages all values that it took, joined by commas; nothing without messages. One
     // that the budget has no room for is lost like a message, with a log line. Nothing is recorded meanwhile.
     [[nodiscard]] std::optional<foundation::Dictionary> createSummaryEventForSession() const;

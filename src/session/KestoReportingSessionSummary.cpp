@@ -109,6 +109,21 @@ std::string fileNamePart(std::string_view text, std::size_t room)
     return part;
 }
 
+// Whether it has the shape of the names that `summaryFileName` makes.
+bool isSummaryFileName(std::string_view name)
+{
+    constexpr std::string_view shape = "dddddddd-dddddd+dddd-kesto-";
+    const auto fits = [](char character, char expected) {
+        switch (expected) {
+        case 'd': return character >= '0' && character <= '9';
+        case '+': return character == '+' || character == '-';
+        default: return character == expected;
+        }
+    };
+    return name.size() > shape.size() && std::ranges::equal(name.substr(0, shape.size()), shape, fits)
+        && name.ends_with(".json");
+}
+
 // An array of one-entry objects, identifier to payload. False when the store holds what JSON cannot say.
 bool writeJson(const KestoReportingMessageStore& store, foundation::PrettyJsonWriter::Sink sink)
 {
@@ -161,7 +176,9 @@ void KestoReportingSession::writeSummaryJson() const
     const std::filesystem::path path = directory / summaryFileName();
     const auto file = files.createAtomically(path);
 
+    std::uint64_t bytes = 0;
     const bool isSerialised = writeJson(*store, [&](std::string_view text) {
+        bytes += text.size();
         if (file)
             (*file)->write(text);
     });
@@ -175,6 +192,8 @@ void KestoReportingSession::writeSummaryJson() const
                   directory.string(), directoryMade.error().message());
 
     auto written = file ? (*file)->commit() : std::unexpected(file.error());
+    if (written)
+        files.keepWithin(directory, {mostSummaryFiles, mostSummaryBytes, isSummaryFileName}, bytes);
     if (written && !directoryMade)
         written = std::unexpected(directoryMade.error());
     if (written)

@@ -312,5 +312,32 @@ TEST(InternalRoadTest, PlayingBecomesAVolumeEventAndASummaryFile)
     EXPECT_EQ(files, 1U);
 }
 
+TEST(InternalRoadTest, OldSummaryFilesGoWhenThereAreTooMany)
+{
+    constexpr std::size_t most = 4096;
+    const auto filesIn = [](const std::filesystem::path& folder) {
+        const std::filesystem::directory_iterator end;
+        return static_cast<std::size_t>(std::distance(std::filesystem::directory_iterator(folder), end));
+    };
+    Kestod kestod(Kestod::Files{{"device.toml", "InternalBuild = true\n"}});
+    const auto folder = kestod.directory() / "logs/Audio/Reporting";
+    std::filesystem::create_directories(folder);
+    for (std::size_t number = 0; number < most; ++number)
+        support::writeFile(folder / ("20260101-000000+0000-kesto-" + std::to_string(number) + "-generic.json"), "[]");
+    support::writeFile(folder / "notes.txt", "of somebody else");
+    kestod.start();
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    client.call(Start, 1);
+    client.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, Array{1});
+    client.call(Stop, 1);
+    client.nextReply();
+    client.nextReply();
+    EXPECT_TRUE(kestod.waitForLog("removed the oldest 1025 files from " + folder.string()
+                                  + ", 1025 since the start: there may be 4096 of 256 MiB together"));
+    EXPECT_EQ(filesIn(folder), most / 4 * 3 + 1);
+    EXPECT_TRUE(std::filesystem::exists(folder / "notes.txt"));
+}
+
 } // namespace
 } // namespace end_to_end

@@ -72,6 +72,7 @@ protected:
             return {};
         const auto& [path, text] = *platform.fileSystem.files.begin();
         EXPECT_EQ(path.parent_path(), "/diagnostics/Audio/Reporting");
+        EXPECT_TRUE(platform.fileSystem.keptWithin.back().kept.isOne(path.filename().native())) << path;
         return {path.filename(), text};
     }
 
@@ -237,6 +238,34 @@ TEST_F(SummaryFile, CutsALongNameBetweenCharacters)
                 expected += character;
             EXPECT_THAT(nameFor(name), EndsWith("-kesto-" + expected + "-longformaudio.json"));
         }
+}
+
+// --- how many there are
+
+TEST_F(SummaryFile, IsOneOfAsManyAsAreKept)
+{
+    record({{"a", 1}});
+    const std::size_t size = write().second.size();
+    ASSERT_THAT(platform.fileSystem.keptWithin, SizeIs(1));
+    const auto& [folder, kept, bytes] = platform.fileSystem.keptWithin.front();
+    EXPECT_EQ(folder, "/diagnostics/Audio/Reporting");
+    EXPECT_EQ(kept.most, KestoReportingSession::mostSummaryFiles);
+    EXPECT_EQ(kept.mostBytes, KestoReportingSession::mostSummaryBytes);
+    EXPECT_EQ(bytes, size);
+    for (const std::string_view other :
+         {"", ".json", "notes.json", "20260101-000000+0000-kesto-", "20260101-000000+0000-kesto-a-generic.json.old",
+          "20260101-000000+0000-other-a-generic.json", "2026-01-01-kesto-a-generic.json",
+          "x20260101-000000+0000-kesto-a-generic.json", "20260101-000000 0000-kesto-a-generic.json",
+          "tracing_results.qdj"})
+        EXPECT_FALSE(kept.isOne(other)) << other;
+}
+
+TEST_F(SummaryFile, IsNotCountedWhenItWasNotWritten)
+{
+    platform.fileSystem.writeError = std::make_error_code(std::errc::no_space_on_device);
+    record({{"a", 1}});
+    write();
+    EXPECT_THAT(platform.fileSystem.keptWithin, IsEmpty());
 }
 
 // --- what it holds

@@ -15,6 +15,12 @@ class FakeFileSystem final : public platform::FileSystem {
 public:
     std::map<std::filesystem::path, unsigned> directories; // with their permissions
     std::map<std::filesystem::path, std::string> files;
+    struct KeptWithin {
+        std::filesystem::path folder;
+        platform::KeptFiles kept;
+        std::uint64_t bytes;
+    };
+    std::vector<KeptWithin> keptWithin; // what was told, in order
     std::error_code directoryError; // of the next attempts, unless it is none
     std::error_code createError;
     std::error_code writeError;
@@ -35,6 +41,10 @@ public:
         if (createError)
             return std::unexpected(createError);
         return std::make_unique<File>(*this, path);
+    }
+    void keepWithin(const std::filesystem::path& folder, const platform::KeptFiles& kept, std::uint64_t bytes) override
+    {
+        keptWithin.push_back({folder, kept, bytes});
     }
     std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path, std::size_t limit) override
     {

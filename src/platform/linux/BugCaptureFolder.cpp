@@ -3,6 +3,7 @@
 #include "platform/linux/BugCaptureFolder.h"
 
 #include "platform/linux/FilesAt.h"
+#include "platform/linux/OldestFirst.h"
 
 #include <algorithm>
 #include <array>
@@ -172,21 +173,19 @@ std::expected<std::string, std::error_code> BugCaptureFolder::nextName(double ti
 // For one capture more, with so many bytes of bulk.
 void BugCaptureFolder::makeRoom(int folder, std::uint64_t bytes) const
 {
-    std::vector<Capture> captures = capturesIn(folder);
-    std::size_t withBulk = 1;
+    const std::vector<Capture> captures = capturesIn(folder);
+    std::vector<std::uint64_t> bulks;
+    for (const Capture& capture : captures)
+        if (capture.bulk)
+            bulks.push_back(*capture.bulk);
+    bulks.push_back(bytes);
+    std::size_t going = surplus(bulks, limits_.mostWithBulk, limits_.mostBytes);
     for (const Capture& capture : captures) {
-        withBulk += capture.bulk ? 1 : 0;
-        bytes += capture.bulk.value_or(0);
-    }
-    for (const Capture& capture : captures) {
-        if (withBulk <= limits_.mostWithBulk && bytes <= limits_.mostBytes)
-            break;
-        if (!capture.bulk)
+        if (!capture.bulk || going == 0)
             continue;
+        --going;
         if (const auto opened = openDirectoryAt(folder, capture.name))
             remove(opened->get(), stateName, folder);
-        --withBulk;
-        bytes -= *capture.bulk;
     }
     const std::size_t most = std::max<std::size_t>(limits_.mostCaptures, 1) - 1;
     for (std::size_t oldest = 0; captures.size() - oldest > most; ++oldest)

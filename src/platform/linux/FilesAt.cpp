@@ -5,8 +5,10 @@
 #include <cerrno>
 #include <dirent.h>
 #include <fcntl.h>
+#include <fmt/format.h>
 #include <limits>
 #include <memory>
+#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -15,6 +17,8 @@ namespace {
 
 constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
 constexpr unsigned deepestTree = 8; // that is removed; none of ours is deeper
+constexpr std::string_view temporaryBegin = ".kestod-";
+constexpr std::string_view temporaryEnd = ".tmp";
 
 std::error_code lastError()
 {
@@ -94,6 +98,22 @@ std::expected<std::string, std::error_code> readFileAt(int directory, const std:
     }
     bytes.resize(length);
     return bytes;
+}
+
+std::string temporaryName()
+{
+    std::uint64_t number = 0;
+    if (::getrandom(&number, sizeof number, 0) != sizeof number)
+        number = static_cast<std::uint64_t>(::getpid());
+    return fmt::format("{}{:016x}{}", temporaryBegin, number, temporaryEnd);
+}
+
+bool isTemporaryName(std::string_view name)
+{
+    constexpr std::size_t digits = 16;
+    return name.size() == temporaryBegin.size() + digits + temporaryEnd.size() && name.starts_with(temporaryBegin)
+        && name.ends_with(temporaryEnd)
+        && name.substr(temporaryBegin.size(), digits).find_first_not_of("0123456789abcdef") == std::string_view::npos;
 }
 
 std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes)

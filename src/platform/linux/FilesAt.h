@@ -26,6 +26,11 @@ namespace platform {
 [[nodiscard]] std::expected<std::string, std::error_code> readFileAt(int directory, const std::string& name,
                                                                      std::size_t most);
 
+// For a file in the making: hidden, and not to be foreseen by who would like to be there first.
+[[nodiscard]] std::string temporaryName();
+// Whether it is the name of one, which is there for good if its maker was killed.
+[[nodiscard]] bool isTemporaryName(std::string_view name);
+
 // Writes a file that is not there yet, down to the disk.
 [[nodiscard]] std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes);
 

@@ -2,12 +2,13 @@
 #include "platform/linux/LinuxFileSystem.h"
 
 #include "foundation/Format.h"
+#include "platform/linux/FilesAt.h"
+#include "platform/linux/FolderKeeper.h"
 #include "platform/linux/SmallFile.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <fcntl.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -72,15 +73,6 @@ private:
     bool isCommitted_ = false;
 };
 
-// Hidden, and not to be foreseen by who would like to be there first.
-std::string temporaryFileName()
-{
-    std::uint64_t number = 0;
-    if (::getrandom(&number, sizeof number, 0) != sizeof number)
-        number = static_cast<std::uint64_t>(::getpid());
-    return foundation::format(".kestod-{:016x}.tmp", number);
-}
-
 // Makes the folder with exactly these permissions, unless something stands there.
 std::error_code makeIfMissing(int parent, const char* name, unsigned permissions)
 {
@@ -128,13 +120,19 @@ LinuxFileSystem::createAtomically(const std::filesystem::path& path)
     auto directory = openDirectory(path.parent_path(), std::nullopt);
     if (!directory)
         return std::unexpected(directory.error());
-    std::string name = temporaryFileName();
+    std::string name = temporaryName();
     FileDescriptor file(
         ::openat(directory->get(), name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByAll));
     if (!file || ::fchmod(file.get(), readableByAll) != 0) // the umask took its part, as it does of folders
         return std::unexpected(lastError());
     return std::make_unique<LinuxAtomicFile>(*std::move(directory), std::move(file), std::move(name),
                                              path.filename().string());
+}
+
+void LinuxFileSystem::keepWithin(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes)
+{
+    if (keeper_ != nullptr)
+        keeper_->added(folder, kept, bytes, [this, folder] { return openDirectory(folder, std::nullopt); });
 }
 
 std::expected<std::string, std::error_code> LinuxFileSystem::readFile(const std::filesystem::path& path,

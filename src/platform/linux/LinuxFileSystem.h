@@ -19,10 +19,15 @@
 
 namespace platform {
 
-// Any thread.
+class FolderKeeper;
+
+// Any thread. It outlives the background queue's work.
 class LinuxFileSystem final : public FileSystem {
 public:
-    explicit LinuxFileSystem(std::filesystem::path diagnosticLogRoot) : diagnosticLogRoot_(std::move(diagnosticLogRoot))
+    // Without a keeper, which outlives it, no folder is kept within limits.
+    explicit LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderKeeper* keeper = nullptr)
+        : diagnosticLogRoot_(std::move(diagnosticLogRoot)),
+          keeper_(keeper)
     {
     }
 
@@ -31,6 +36,7 @@ public:
                                                                          unsigned permissions) override;
     [[nodiscard]] std::expected<std::unique_ptr<AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) override;
+    void keepWithin(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes) override;
     [[nodiscard]] std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,
                                                                        std::size_t limit) override;
 
@@ -40,6 +46,7 @@ private:
     openDirectory(const std::filesystem::path& path, std::optional<unsigned> permissionsOfMissing) const;
 
     const std::filesystem::path diagnosticLogRoot_;
+    FolderKeeper* const keeper_;
 };
 
 } // namespace platform

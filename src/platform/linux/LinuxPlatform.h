@@ -10,6 +10,7 @@
 #include "platform/Platform.h"
 #include "platform/linux/AnalyticsStore.h"
 #include "platform/linux/ConfigurationWatcher.h"
+#include "platform/linux/FolderKeeper.h"
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/LinuxBugCapture.h"
 #include "platform/linux/LinuxClock.h"
@@ -49,6 +50,7 @@ private:
     LinuxFeatureFlags featureFlags_;
     LinuxDeviceProperties deviceProperties_;
     LinuxProcessTable processTable_;
+    FolderKeeper folderKeeper_;
     LinuxFileSystem fileSystem_;
     TracefsMarkers traceMarkers_;
     TraceMarkerAccess traceMarkerAccess_;
