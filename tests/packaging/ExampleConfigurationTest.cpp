@@ -47,11 +47,15 @@ TEST(ExampleConfiguration, DeviceAndFeaturesAreOffAsWithoutAFile)
 
 TEST(ExampleConfiguration, PreferencesAreShownButNotSet)
 {
-    const std::string text = textOf("preferences/com.quarn.kesto.toml");
-    EXPECT_EQ(parsed(text), Dictionary());
-    const std::regex commentedSetting("(^|\n)# ([a-z_]+ = )");
-    EXPECT_EQ(parsed(std::regex_replace(text, commentedSetting, "$1$2")),
-              (Dictionary{{"device_name", "Kitchen radio"}, {"disable_reporting", true}}));
+    const std::pair<std::string, Dictionary> domains[] = {
+        {"com.quarn.kesto", {{"device_name", "Kitchen radio"}, {"disable_reporting", true}}},
+        {"com.quarn.halden", {{"spatial-audio-accessory-feature", true}}}};
+    for (const auto& [domain, shown] : domains) {
+        const std::string text = textOf("preferences/" + domain + ".toml");
+        EXPECT_EQ(parsed(text), Dictionary());
+        const std::regex commentedSetting("(^|\n)# ([a-z_-]+ = )");
+        EXPECT_EQ(parsed(std::regex_replace(text, commentedSetting, "$1$2")), shown);
+    }
 }
 
 } // namespace

@@ -6,13 +6,13 @@
 // what has changed, twice a second at most, each at once: a reader sees the old file or the new one.
 //
 //     kesto_publisher *publisher;
-//     kesto_publisher_open(NULL, &publisher);
+//     if (kesto_publisher_open(NULL, &publisher) != KESTO_OK)
+//         return;
 //
 //     kesto_channel *late;
 //     const kesto_channel_name name = {.driver = "mixer", .group = "Tx", .channel = "late cycles"};
-//     kesto_channel_create_simple(publisher, &name, &late);
-//     ...
-//     kesto_channel_add(late, 1);
+//     if (kesto_channel_create_simple(publisher, &name, &late) == KESTO_OK)
+//         kesto_channel_add(late, 1);
 //     ...
 //     kesto_publisher_free(publisher);
 //

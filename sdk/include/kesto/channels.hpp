@@ -1,9 +1,10 @@
 // libkesto for C++, publishing: counters, histograms and states of a driver, for the Kesto reporting service (kestod).
 //
 //     kesto::Publisher publisher;
-//     publisher.open();
 //     kesto::SimpleChannel late;
-//     late.create(publisher, {"mixer", "Tx", "", "late cycles"});
+//     if (publisher.open() != kesto::Status::Ok
+//         || late.create(publisher, {"mixer", "Tx", "", "late cycles"}) != kesto::Status::Ok)
+//         return;
 //     late.add(1);
 //
 // A thin layer over channels.h, all of it inline; what that says about threads, real time, forks and names holds

@@ -6,7 +6,8 @@
 // nothing, and makes no system call (see there for the one exception).
 //
 //     kesto_client *client;
-//     kesto_client_open(NULL, &client);
+//     if (kesto_client_open(NULL, &client) != KESTO_OK)
+//         return;
 //     kesto_client_create_session(client, 42, NULL, NULL, NULL);
 //     kesto_client_start_session(client, 42, NULL, NULL, NULL);
 //     ...

@@ -1,7 +1,8 @@
 // libkesto for C++: reports what a program does with audio to the Kesto reporting service (kestod).
 //
 //     kesto::Client client;
-//     client.open();
+//     if (client.open() != kesto::Status::Ok)
+//         return;
 //     client.createSession(42);
 //     client.setServiceType(kesto::ServiceType::LongFormAudio, 42);
 //     client.startSession(42);

@@ -7,7 +7,8 @@
 //
 //     const kesto_options options = {.size = sizeof options, .trace = true};
 //     kesto_client *client;
-//     kesto_client_open(&options, &client);
+//     if (kesto_client_open(&options, &client) != KESTO_OK)
+//         return;
 //     const kesto_tracer *tracer = kesto_client_tracer(client);
 //     ...
 //     kesto_trace(tracer, 0x21040010, buffer, 0, 0, 0);

@@ -4,7 +4,8 @@
 //     kesto::Options options;
 //     options.trace = true;
 //     kesto::Client client;
-//     client.open(options);
+//     if (client.open(options) != kesto::Status::Ok)
+//         return;
 //     const kesto::Tracer tracer(client);
 //     {
 //         const kesto::TraceInterval mixing(tracer, 0x21040010, 0x21040014);
