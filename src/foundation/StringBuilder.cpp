@@ -21,6 +21,22 @@ String StringBuilder::finish() &&
     return String(Reference<StringObject>::adopt(StringObject::createIn(memory_.release(), std::exchange(size_, 0))));
 }
 
+// What stands there already serves as a longer and longer pattern, up to what a processor keeps at hand.
+void StringBuilder::repeatLast(std::size_t size, std::size_t times)
+{
+    constexpr std::size_t longPattern = std::size_t{16} << 10;
+    std::size_t missing = size * times;
+    if (capacity_ - size_ < missing)
+        grow(missing);
+    const char* const pattern = bytes() + size_ - size;
+    for (std::size_t length = size; missing != 0; length = length < longPattern ? length * 2 : length) {
+        const std::size_t count = std::min(length, missing);
+        std::memcpy(bytes() + size_, pattern, count);
+        size_ += count;
+        missing -= count;
+    }
+}
+
 void StringBuilder::grow(std::size_t additional)
 {
     constexpr std::size_t smallest = 32;

@@ -45,6 +45,10 @@ public:
     [[nodiscard]] std::size_t size() const noexcept { return size_; }
 
     void append(char character) { append(std::string_view(&character, 1)); }
+    // Appends the last `size` characters again, so many times.
+    void repeatLast(std::size_t size, std::size_t times);
+    // Takes the last character away; there is one.
+    void dropLast() noexcept { --size_; }
 
     // Leaves an empty builder.
     [[nodiscard]] String finish() &&;

@@ -42,15 +42,9 @@ public:
     public:
         [[nodiscard]] foundation::Dictionary dictionary() const;
 
-        // Calls `visit` with the key and the value of each entry. The value is a `foundation::CborItem` or a
-        // `foundation::Value`, which answer the same questions.
-        template <typename Visit> void forEach(Visit visit) const
-        {
-            if (kept_ == nullptr)
-                return foundation::forEachCborEntry(foundation::CborItem(encoded_), visit);
-            for (const auto& [key, value] : *kept_)
-                visit(key.view(), value);
-        }
+        // What is kept is one of the two: the encoding, or a large payload as it came (`KestoReportingEntryReader`).
+        [[nodiscard]] std::string_view encoded() const noexcept { return encoded_; }
+        [[nodiscard]] const foundation::Dictionary* kept() const noexcept { return kept_; }
 
     private:
         friend class KestoReportingMessageStore;

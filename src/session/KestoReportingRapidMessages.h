@@ -6,7 +6,11 @@
 
 #include "session/KestoReportingMessageStore.h"
 
+#include <algorithm>
+#include <cstddef>
 #include <optional>
+#include <utility>
+#include <vector>
 
 // Tells where one burst ends and the next begins. A pause is measured from the payload before, not from the
 // first of the burst; one without a time counts as 0, and leaves the next without anything to be measured from.
@@ -30,31 +34,74 @@ private:
     std::optional<double> lastTime_;
 };
 
+// The payloads of the messages in order, which may be looked at before their turn. The next of those are kept until it
+// comes: every message is read twice at most, and once where bursts are close to each other.
+template <typename Payloads> class KestoReportingPayloadSequence {
+public:
+    using Payload = decltype(std::declval<Payloads&>().read(std::declval<const KestoReportingMessageStore::Cursor&>()));
+
+    KestoReportingPayloadSequence(const KestoReportingMessageStore& messages, Payloads& payloads)
+        : cursor_(messages),
+          payloads_(payloads)
+    {
+    }
+
+    // The next payload; nothing when there is none.
+    std::optional<Payload> next()
+    {
+        if (taken_ != kept_.size())
+            return std::move(kept_[taken_++]);
+        kept_.clear();
+        taken_ = 0;
+        return cursor_.next() ? std::optional(payloads_.read(cursor_)) : std::nullopt;
+    }
+
+    // Calls `visit` with the payloads that are still to come, until it returns false.
+    template <typename Visit> void lookAhead(Visit visit)
+    {
+        bool goesOn = std::all_of(kept_.begin() + static_cast<std::ptrdiff_t>(taken_), kept_.end(), visit);
+        for (auto ahead = cursor_; goesOn && ahead.next();) {
+            Payload payload = payloads_.read(ahead);
+            goesOn = visit(payload);
+            if (kept_.size() == mostKept)
+                continue;
+            kept_.push_back(std::move(payload));
+            cursor_ = ahead;
+        }
+    }
+
+private:
+    static constexpr std::size_t mostKept = 256;
+
+    KestoReportingMessageStore::Cursor cursor_; // at the last message that was taken or is kept
+    Payloads& payloads_;
+    std::vector<Payload> kept_; // behind those taken
+    std::size_t taken_ = 0; // of the kept
+};
+
 // Calls `visit` with the payloads of the messages in order, those of a burst as one at the place of the first of them.
 //
-// `payloads` has the payload's type `Payload`, and the functions `read(stored)`, `isCombinable(payload)`,
-// `timeOf(payload)` and `merge(into, payload)`. Nothing is kept of the messages but the payload at hand: the rest of a
-// burst is looked for ahead of its place, so that every message is read twice at most.
+// `payloads` has the functions `read(cursor)`, `isCombinable(payload)`, `timeOf(payload)` and `merge(into, payload)`.
 template <typename Payloads, typename Visit>
 void KestoReportingCombineRapidMessages(const KestoReportingMessageStore& messages, double maximumPausetime,
                                         Payloads& payloads, Visit visit)
 {
     KestoReportingBursts bursts(maximumPausetime);
-    for (KestoReportingMessageStore::Cursor cursor(messages); cursor.next();) {
-        auto payload = payloads.read(cursor.payload());
-        if (payloads.isCombinable(payload)) {
-            if (!bursts.beginsWith(payloads.timeOf(payload)))
+    KestoReportingPayloadSequence sequence(messages, payloads);
+    while (auto payload = sequence.next()) {
+        if (payloads.isCombinable(*payload)) {
+            if (!bursts.beginsWith(payloads.timeOf(*payload)))
                 continue; // is in the burst's payload already
-            auto ahead = bursts;
-            for (auto rest = cursor; rest.next();) {
-                const auto member = payloads.read(rest.payload());
+            auto burstsAhead = bursts;
+            sequence.lookAhead([&](const auto& member) {
                 if (!payloads.isCombinable(member))
-                    continue;
-                if (ahead.beginsWith(payloads.timeOf(member)))
-                    break;
-                payloads.merge(payload, member);
-            }
+                    return true;
+                if (burstsAhead.beginsWith(payloads.timeOf(member)))
+                    return false;
+                payloads.merge(*payload, member);
+                return true;
+            });
         }
-        visit(payload);
+        visit(*payload);
     }
 }

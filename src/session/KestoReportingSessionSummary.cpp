@@ -6,6 +6,7 @@
 #include "foundation/PrettyJsonWriter.h"
 #include "foundation/StringBuilder.h"
 #include "platform/Platform.h"
+#include "session/KestoReportingEntryReader.h"
 #include "session/KestoReportingSession.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -29,70 +30,101 @@ class ValuesByKey {
 public:
     explicit ValuesByKey(std::shared_ptr<KestoReportingStorageBudget> budget) : share_(std::move(budget)) { }
 
-    template <typename Item> void append(std::string_view key, const Item& value)
+    // Which of the texts is the key's. Keys come in the same order in nearly every message: the one behind the last
+    // is tried first. A sorted index otherwise: no choice of keys makes it slow.
+    std::size_t positionOf(std::string_view key)
     {
-        if (isOutOfMemory_)
-            return;
-        const bool isFirst = !moveTo(key);
-        foundation::StringBuilder& text = values_[position_].text;
-        const std::size_t sizeBefore = text.size();
-        if (!isFirst)
-            text.append(',');
-        if (const auto number = value.number())
-            number->appendText(text);
-        else if (value.kind() == foundation::Value::Kind::String)
-            text.append(value.stringView());
-        else
-            text.append(value.text());
-        pay((isFirst ? bytesOfAKey + key.size() : 0) + text.size() - sizeBefore);
+        if (const std::size_t next = last_ + 1; next < values_.size() && values_[next].key == key)
+            return next;
+        if (const auto found = positions_.find(key); found != positions_.end())
+            return found->second;
+        values_.push_back({.key = key});
+        positions_.emplace(values_.back().key, values_.size() - 1);
+        pay(bytesOfAKey + key.size());
+        return values_.size() - 1;
     }
+
+    // The item last given for the key, at the place where it was, is a repetition, which costs next to nothing.
+    template <typename Item> void append(std::size_t position, const Item& value)
+    {
+        last_ = position;
+        Values& values = values_[position];
+        const char* place = nullptr;
+        if constexpr (requires { value.bytes(); })
+            place = value.bytes().data();
+        if (place != nullptr && place == values.place) {
+            ++values.repetitions;
+            return;
+        }
+        appendRepetitions(values);
+        appendText(values, value);
+        values.place = place;
+    }
+
+    // Whether the budget had too little memory, which makes all further work vain.
+    [[nodiscard]] bool isOutOfMemory() const { return isOutOfMemory_; }
 
     // Nothing when the budget had too little memory.
     std::optional<Dictionary> finish() &&
     {
-        if (isOutOfMemory_)
-            return std::nullopt;
         Dictionary::Entries entries;
-        for (auto& [key, text] : values_)
-            entries.push_back({key, std::move(text).finish()});
+        for (Values& values : values_) {
+            appendRepetitions(values);
+            if (isOutOfMemory_)
+                return std::nullopt;
+            values.text.dropLast(); // the comma
+            entries.push_back({values.key, std::move(values.text).finish()});
+        }
         return entries;
     }
 
 private:
     struct Values {
         foundation::String key;
-        foundation::StringBuilder text;
+        foundation::StringBuilder text = {}; // with a comma behind each value
+        std::size_t lastSize = 0; // of the last value's text, with its comma
+        const char* place = nullptr; // of the last value, if it is encoded
+        std::size_t repetitions = 0; // of the last value that are still to be written
     };
     static constexpr std::size_t bytesOfAKey = 256; // in all that knows it, here and in the dictionary
     static constexpr std::size_t paidAtOnce = 4096;
 
-    // False when the key is new. Keys come in the same order in nearly every message: the next one is tried first.
-    // A sorted index otherwise: no choice of keys makes it slow.
-    bool moveTo(std::string_view key)
+    template <typename Item> void appendText(Values& values, const Item& value)
     {
-        ++position_;
-        if (position_ < values_.size() && values_[position_].key == key)
-            return true;
-        const auto found = positions_.find(key);
-        position_ = found == positions_.end() ? values_.size() : found->second;
-        if (found != positions_.end())
-            return true;
-        values_.push_back({key, {}});
-        positions_.emplace(values_.back().key, position_);
-        return false;
+        if (isOutOfMemory_)
+            return;
+        foundation::StringBuilder& text = values.text;
+        const std::size_t sizeBefore = text.size();
+        if (const auto number = value.number())
+            number->appendText(text);
+        else if (value.kind() == foundation::Value::Kind::String)
+            text.append(value.stringView());
+        else
+            text.append(value.text());
+        text.append(',');
+        values.lastSize = text.size() - sizeBefore;
+        pay(values.lastSize);
+    }
+
+    void appendRepetitions(Values& values)
+    {
+        pay(values.lastSize * values.repetitions);
+        if (!isOutOfMemory_)
+            values.text.repeatLast(values.lastSize, values.repetitions);
+        values.repetitions = 0;
     }
 
     void pay(std::size_t bytes)
     {
         used_ += bytes;
         if (used_ > share_.bytes())
-            isOutOfMemory_ = !share_.grow(std::max(used_ - share_.bytes(), paidAtOnce));
+            isOutOfMemory_ = isOutOfMemory_ || !share_.grow(std::max(used_ - share_.bytes(), paidAtOnce));
     }
 
     std::vector<Values> values_;
     std::map<std::string_view, std::size_t>
         positions_; // the keys are those of `values_`, whose characters stay in place
-    std::size_t position_ = 0;
+    std::size_t last_ = 0; // the position of the value that came last
     KestoReportingStorageShare share_;
     std::size_t used_ = 0;
     bool isOutOfMemory_ = false;
@@ -128,15 +160,18 @@ bool isSummaryFileName(std::string_view name)
 bool writeJson(const KestoReportingMessageStore& store, foundation::PrettyJsonWriter::Sink sink)
 {
     foundation::PrettyJsonWriter writer(std::move(sink));
+    KestoReportingEntryReader<std::string_view> entries;
     writer.beginArray();
     store.forEach([&](const KestoReportingMessageStore::Message& message) {
         writer.beginObject();
         writer.key(store.identifier(message));
         writer.beginObject();
-        message.payload.forEach([&](std::string_view key, const auto& value) {
-            writer.key(key);
-            writer.write(value);
-        });
+        entries.read(
+            message.kind, message.payload, [](std::string_view key) { return key; },
+            [&](std::string_view key, const auto& value) {
+                writer.key(key);
+                writer.write(value);
+            });
         writer.endObject();
         writer.endObject();
     });
@@ -152,10 +187,13 @@ std::optional<Dictionary> KestoReportingSession::createSummaryEventForSession() 
     if (!nestedAggregatedPayloadData_ || nestedAggregatedPayloadData_->empty())
         return std::nullopt;
     ValuesByKey values(budget_);
-    values.append(summaryKey, foundation::Value(serviceType_.load()));
-    nestedAggregatedPayloadData_->forEach([&](const KestoReportingMessageStore::Message& message) {
-        message.payload.forEach([&](std::string_view key, const auto& value) { values.append(key, value); });
-    });
+    values.append(values.positionOf(summaryKey), foundation::Value(serviceType_.load()));
+    KestoReportingEntryReader<std::size_t> entries;
+    KestoReportingMessageStore::Cursor cursor(*nestedAggregatedPayloadData_);
+    while (!values.isOutOfMemory() && cursor.next())
+        entries.read(
+            cursor.kind(), cursor.payload(), [&](std::string_view key) { return values.positionOf(key); },
+            [&](std::size_t position, const auto& value) { values.append(position, value); });
     auto summary = std::move(values).finish();
     if (!summary) {
         ++messagesLost_;

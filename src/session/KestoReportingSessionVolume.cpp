@@ -30,7 +30,7 @@ constexpr std::array keysOfAnEvent{
 struct VolumePayloads {
     KestoReportingVolumeFieldsReader reader;
 
-    Fields read(const KestoReportingMessageStore::Payload& payload) { return reader.read(payload); }
+    Fields read(const KestoReportingMessageStore::Cursor& message) { return reader.read(message); }
     static bool isCombinable(const Fields& payload)
     {
         return payload.has(Key::SpatialAudioAccessoryFeature) || payload.has(Key::SpatializationEnabled);
@@ -46,7 +46,7 @@ struct VolumePayloads {
 struct WholePayloads {
     std::span<const std::string_view> keysToCombine;
 
-    static Dictionary read(const KestoReportingMessageStore::Payload& payload) { return payload.dictionary(); }
+    static Dictionary read(const KestoReportingMessageStore::Cursor& message) { return message.payload().dictionary(); }
     [[nodiscard]] bool isCombinable(const Dictionary& payload) const
     {
         return std::ranges::any_of(keysToCombine, [&](std::string_view key) { return payload.contains(key); });

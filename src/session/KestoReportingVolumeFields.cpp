@@ -82,11 +82,10 @@ void KestoReportingVolumeFields::merge(const KestoReportingVolumeFields& other)
             items_[index] = other.items_[index];
 }
 
-KestoReportingVolumeFields KestoReportingVolumeFieldsReader::read(const KestoReportingMessageStore::Payload& payload)
+KestoReportingVolumeFields KestoReportingVolumeFieldsReader::read(const KestoReportingMessageStore::Cursor& message)
 {
     KestoReportingVolumeFields fields;
-    payload.forEach([&](std::string_view name, const auto& value) {
-        const auto key = keyOf(name);
+    entries_.read(message.kind(), message.payload(), keyOf, [&](std::optional<Key> key, const auto& value) {
         if (!key)
             return;
         if constexpr (requires { value.bytes(); })

@@ -5,6 +5,7 @@
 #pragma once
 
 #include "foundation/CborView.h"
+#include "session/KestoReportingEntryReader.h"
 #include "session/KestoReportingMessageStore.h"
 
 #include <array>
@@ -41,10 +42,12 @@ public:
     // The value as it counts where a number or a truth value is asked for.
     [[nodiscard]] foundation::Number number(Key key) const;
     [[nodiscard]] bool boolean(Key key) const;
-    // Whether both are the same bytes, and so surely equal text.
+    // Whether both are the same bytes, and so surely equal text. Mostly they even stand at the same place.
     [[nodiscard]] bool isSameEncoding(const KestoReportingVolumeFields& other, Key key) const
     {
-        return item(key).bytes() == other.item(key).bytes();
+        const std::string_view ours = item(key).bytes();
+        const std::string_view theirs = other.item(key).bytes();
+        return ours.data() == theirs.data() || ours == theirs;
     }
 
     void set(Key key, foundation::CborItem item) { items_[static_cast<std::size_t>(key)] = item; }
@@ -60,10 +63,11 @@ private:
 // Reads the fields of payloads; they are valid as long as the reader and the store.
 class KestoReportingVolumeFieldsReader {
 public:
-    [[nodiscard]] KestoReportingVolumeFields read(const KestoReportingMessageStore::Payload& payload);
+    [[nodiscard]] KestoReportingVolumeFields read(const KestoReportingMessageStore::Cursor& message);
     // The value, encoded and kept here.
     [[nodiscard]] foundation::CborItem keep(const foundation::Value& value);
 
 private:
+    KestoReportingEntryReader<std::optional<KestoReportingVolumeKey>> entries_;
     std::deque<std::string> kept_;
 };
