@@ -2,8 +2,10 @@
 #include "kesto-pipewire/DeviceChannels.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <chrono>
 #include <cmath>
+#include <system_error>
 #include <utility>
 #include <vector>
 
@@ -26,6 +28,12 @@ const char* cycleGroup(Direction direction)
     return direction == Direction::Output ? "Tx" : "Rx";
 }
 
+// Right after it was returned.
+std::string reasonOf(kesto::Status status)
+{
+    return status == kesto::Status::SystemError ? std::generic_category().message(errno) : kesto::errorText(status);
+}
+
 // The first of several that failed.
 template <typename... Create> kesto::Status createAll(Create... create)
 {
@@ -45,7 +53,7 @@ DeviceChannels::DeviceChannels(std::string root, const Diagnostics& diagnostics)
     if (status == kesto::Status::Ok)
         status = createTotals();
     if (status != kesto::Status::Ok)
-        diagnostics_.say("statistics of devices cannot be published: {}", kesto::errorText(status));
+        diagnostics_.say("statistics of devices cannot be published: {}", reasonOf(status));
 }
 
 kesto::Status DeviceChannels::createTotals()
@@ -100,7 +108,7 @@ void DeviceChannels::deviceAppeared(DeviceSerial serial, const DeviceDescription
     Device device;
     device.direction = description.direction;
     if (const auto status = create(device, description); status != kesto::Status::Ok)
-        diagnostics_.detail("no statistics of {}: {}", description.name, kesto::errorText(status));
+        diagnostics_.detail("no statistics of {}: {}", description.name, reasonOf(status));
     devices_.insert_or_assign(serial, std::move(device));
 }
 

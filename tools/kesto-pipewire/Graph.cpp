@@ -71,20 +71,15 @@ void Graph::addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Mome
     if (!hasRoom(links_.size(), maximumObjects))
         return;
     links_[link] = {outputNode, inputNode};
-    for (const auto node : {outputNode, inputNode}) {
-        tellDevices(node, when);
-        tellWanted(node, when);
-    }
+    for (const auto node : {outputNode, inputNode})
+        tellLinks(node, when);
 }
 
 void Graph::remove(ObjectID object, Moment when)
 {
-    if (const auto link = links_.extract(object)) {
-        for (const auto node : {link.mapped().outputNode, link.mapped().inputNode}) {
-            tellDevices(node, when);
-            tellWanted(node, when);
-        }
-    }
+    if (const auto link = links_.extract(object))
+        for (const auto node : {link.mapped().outputNode, link.mapped().inputNode})
+            tellLinks(node, when);
     removeNode(object, when);
     clients_.erase(object);
 }
@@ -104,7 +99,15 @@ void Graph::removeNode(ObjectID id, Moment when)
         deviceListener_.deviceGone(node.serial);
 
     // Links go before their nodes; one that did not must not tie the ID's next owner to this one's partners.
-    std::erase_if(links_, [id](const auto& link) { return link.second.touches(id); });
+    std::set<ObjectID> partners;
+    std::erase_if(links_, [&](const auto& entry) {
+        const auto& link = entry.second;
+        if (link.touches(id))
+            partners.insert(link.outputNode == id ? link.inputNode : link.outputNode);
+        return link.touches(id);
+    });
+    for (const auto partner : partners)
+        tellLinks(partner, when);
 }
 
 void Graph::endStreams(Moment when)
@@ -219,6 +222,12 @@ std::string Graph::devicesOf(ObjectID id) const
     for (const auto name : names)
         devices.append(devices.empty() ? "" : ",").append(name);
     return tidyText(devices, maximumDevicesBytes);
+}
+
+void Graph::tellLinks(ObjectID id, Moment when)
+{
+    tellDevices(id, when);
+    tellWanted(id, when);
 }
 
 void Graph::tellWanted(ObjectID id, Moment when)

@@ -97,6 +97,7 @@ private:
     [[nodiscard]] Node* appearedStream(ObjectID node);
     [[nodiscard]] std::string applicationOf(const Node& node, const Identity& own) const;
     [[nodiscard]] std::string devicesOf(ObjectID node) const;
+    void tellLinks(ObjectID node, Moment when);
     void tellDevices(ObjectID node, Moment when);
     void tellWanted(ObjectID node, Moment when);
     void removeNode(ObjectID node, Moment when);

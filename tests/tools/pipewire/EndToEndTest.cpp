@@ -71,6 +71,13 @@ protected:
             line = reporter->readLine();
         return !line.empty();
     }
+    // The service follows those groups in which there are channels when it starts, and the first one is there too soon.
+    void startServiceThatFindsChannels()
+    {
+        ASSERT_TRUE(reporterSays("connected to the reporting service"));
+        killService();
+        startService();
+    }
     void killService()
     {
         service->kill(SIGKILL);
@@ -248,9 +255,7 @@ TEST_F(EndToEndTest, TwoStreamsAtOnceDoNotMix)
 
 TEST_F(EndToEndTest, ASessionsEndTellsWhatTheDevicesDid)
 {
-    ASSERT_TRUE(reporterSays("connected to the reporting service"));
-    killService(); // the next one finds channels in every group
-    startService();
+    startServiceThatFindsChannels();
     {
         const auto player = server.playTone("Music");
         ASSERT_TRUE(comes("kesto.Playback.Start"));
@@ -267,6 +272,19 @@ TEST_F(EndToEndTest, ASessionsEndTellsWhatTheDevicesDid)
                 ElementsAre(testing::HasSubstr("unit=us::")));
     EXPECT_THAT(values("kesto.Cavlet.State", "pipewire_Speaker_null-sink_State_state"),
                 ElementsAre(testing::HasSubstr("name:Running,")));
+}
+
+TEST_F(EndToEndTest, ATerminatedReporterStillTellsWhatTheDevicesDid)
+{
+    startServiceThatFindsChannels();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(comes("kesto.Playback.Start"));
+    letItPlay(2500ms);
+    reporter->kill(SIGTERM);
+    EXPECT_EQ(reporter->wait(), 0);
+
+    ASSERT_TRUE(comes("kesto.Cavlet.Simple"));
+    EXPECT_GT(std::stoi(values("kesto.Cavlet.Simple", "pipewire_Tx_null-sink_Simple_cycles").at(0)), 20);
 }
 
 TEST_F(EndToEndTest, AServiceThatIsKilledIsToldTheStateAgainWhenItIsBack)
@@ -353,6 +371,18 @@ TEST_F(CommandLineTest, HelpAndVersionAreNoErrors)
     const auto version = run({"--version"});
     EXPECT_THAT(version.firstLine, testing::StartsWith("kesto-pipewire "));
     EXPECT_EQ(version.status, 0);
+}
+
+TEST_F(CommandLineTest, EveryOptionOfTheHelpIsCompleted)
+{
+    Program bash({"bash", "-c",
+                  "source " KESTO_COMPLETION "; COMP_WORDS=(kesto-pipewire --); COMP_CWORD=1; _kesto_pipewire;"
+                  "$0 --help | grep -oE -e '--[a-z]+' | sort -u | while read -r option; do"
+                  "  [[ \" ${COMPREPLY[*]} \" == *\" $option \"* ]] && echo \"$option\"; done; echo end",
+                  KESTO_PIPEWIRE},
+                 {});
+    for (const auto* option : {"--channels", "--help", "--remote", "--socket", "--verbose", "--version", "end"})
+        EXPECT_EQ(bash.readLine(), option);
 }
 
 TEST_F(CommandLineTest, WrongUseIsToldByTheStatus)

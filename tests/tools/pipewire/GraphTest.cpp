@@ -188,6 +188,32 @@ TEST_F(GraphTest, WhoComesLateLearnsOfLinksThatAreThere)
     EXPECT_THAT(listener.news(), ElementsAre("500 appeared output role= application=", "500 devices 'speaker'"));
 }
 
+TEST_F(GraphTest, WhatGoesBeforeItsLinksLetsGoOfTheirOtherEnds)
+{
+    addStream(40, 500);
+    addStream(41, 501, "monitor", "Stream/Input/Audio");
+    graph.addLink(50, 40, sink, now);
+    graph.addLink(51, 40, sink, now);
+    graph.addLink(52, sink, 41, now);
+    listener.news();
+    devices.news();
+    graph.remove(40, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 gone"));
+    EXPECT_THAT(devices.news(), ElementsAre("30 wanted")); // by the other stream
+    graph.remove(41, now);
+    EXPECT_THAT(devices.news(), ElementsAre("30 unwanted"));
+
+    addStream(42, 502);
+    graph.addLink(53, 42, sink, now);
+    listener.news();
+    devices.news();
+    graph.remove(sink, now);
+    EXPECT_THAT(devices.news(), ElementsAre("30 gone"));
+    EXPECT_THAT(listener.news(), ElementsAre("502 devices ''"));
+    graph.remove(53, now); // the link's own end says nothing new
+    EXPECT_THAT(listener.news(), IsEmpty());
+}
+
 TEST_F(GraphTest, AnIDThatIsUsedAgainIsAnotherStream)
 {
     addStream(node, 500);
