@@ -159,6 +159,63 @@ TEST_F(ExamplesTest, TheDriverHelpersInCAndCPlusPlusPublish)
     expectPublishes(inCpp);
 }
 
+// The examples in a text: of a document, what stands in fences of that language; of a header, what is indented in its
+// comments. Each in a function of its own, behind what all of them include.
+std::string functionsOf(const std::vector<std::string>& files, const std::string& language, std::size_t& count)
+{
+    std::string includes;
+    std::string functions;
+    for (const std::string& file : files) {
+        std::ifstream stream(file);
+        EXPECT_TRUE(stream) << file;
+        const bool isDocument = file.ends_with(".md");
+        bool isInside = false;
+        for (std::string line; std::getline(stream, line);) {
+            constexpr std::string_view indented = "//     ";
+            const bool isFence = isDocument && line.starts_with("```");
+            const bool isExample = isDocument ? isInside != isFence && (isInside || line == "```" + language)
+                                              : line.starts_with(indented) || (isInside && line == "//");
+            if (isExample && !isInside)
+                functions += "void example" + std::to_string(++count) + "()\n{\n";
+            if (!isExample && isInside)
+                functions += "}\n";
+            isInside = isExample;
+            if (!isExample || isFence)
+                continue;
+            const std::string code = isDocument ? line : line.substr(std::min(line.size(), indented.size()));
+            if (code.starts_with("#include"))
+                includes += code + '\n';
+            else if (code != "...")
+                functions += code + '\n';
+        }
+    }
+    return includes + "void mix(uint64_t buffer);\nextern uint64_t buffer, frames;\n" + functions;
+}
+
+TEST_F(ExamplesTest, WhatDocumentsAndHeadersShowCompilesAsItStands)
+{
+    const std::string source = KESTO_SOURCE_DIRECTORY "/";
+    const std::string headers = prefix() + "/include/kesto/";
+    std::size_t inC = 0;
+    const std::string fileInC = *directory_ / "shown.c";
+    std::ofstream(fileInC) << "#include <kesto/channels.h>\n#include <kesto/trace.h>\n"
+                           << functionsOf({headers + "kesto.h", headers + "channels.h", headers + "trace.h"}, "c", inC);
+    EXPECT_EQ(inC, 4U);
+    compile({KESTO_C_COMPILER, "-std=c11", "-fsyntax-only", "-Wall", "-Wextra", "-Wno-unused", "-Werror", fileInC},
+            {"--cflags"});
+
+    std::size_t inCpp = 0;
+    const std::string fileInCpp = *directory_ / "shown.cpp";
+    std::ofstream(fileInCpp)
+        << "#include <kesto/channels.hpp>\n#include <kesto/trace.hpp>\nextern kesto::Client client;\n"
+        << functionsOf({source + "README.md", source + "docs/libkesto.md", headers + "kesto.hpp",
+                        headers + "channels.hpp", headers + "trace.hpp"},
+                       "c++", inCpp);
+    EXPECT_EQ(inCpp, 7U);
+    compile({KESTO_CXX_COMPILER, "-std=c++17", "-fsyntax-only", "-Wall", "-Wextra", "-Werror", fileInCpp},
+            {"--cflags"});
+}
+
 TEST_F(ExamplesTest, AProjectFindsTheLibraryWithCMake)
 {
     const std::string project = *directory_ / "project";
