@@ -51,7 +51,7 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
 
 TEST_F(Completion, NamesEveryOptionThatTheToolHas)
 {
-    for (const std::string verb : {"channels", "client", "events", "summary", "notify", "trace", "trace record",
+    for (const std::string verb : {"bugs", "channels", "client", "events", "summary", "notify", "trace", "trace record",
                                    "prefs get", "prefs set", "prefs unset", "prefs list"}) {
         std::istringstream help(tool.runShell("$kesto " + verb + " --help").output);
         const auto offered = completions(verb + " --");
