@@ -60,9 +60,12 @@ std::size_t textSize(const foundation::Dictionary& summary)
     return size;
 }
 
+// All work begins with memory fresh from the system, as it does when a service has a long session end: whoever found
+// what the round before left behind would be spared the first touch of every page.
 template <typename Work> Contestant millisecondsOf(Work work)
 {
     return [work] {
+        ::malloc_trim(0);
         const auto start = Clock::now();
         work();
         return nanosecondsSince(start) / 1e6;
