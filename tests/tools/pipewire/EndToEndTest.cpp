@@ -16,6 +16,7 @@
 #include <fstream>
 #include <memory>
 #include <thread>
+#include <utility>
 
 namespace kesto_pipewire {
 
@@ -125,6 +126,20 @@ protected:
             std::this_thread::sleep_for(5ms);
         }
         return true;
+    }
+    // How often the threads of the reporter have gone to sleep, and so woken before.
+    [[nodiscard]] std::uint64_t reporterSleeps() const
+    {
+        std::uint64_t sleeps = 0;
+        const std::string name = "voluntary_ctxt_switches:";
+        for (const auto& thread :
+             std::filesystem::directory_iterator("/proc/" + std::to_string(reporter->pid()) + "/task")) {
+            std::ifstream status(thread.path() / "status");
+            for (std::string line; std::getline(status, line);)
+                if (line.starts_with(name))
+                    sleeps += std::stoull(line.substr(name.size()));
+        }
+        return sleeps;
     }
     // Sound takes its time, and how much of it is what the test is about.
     static void letItPlay(std::chrono::milliseconds duration) { std::this_thread::sleep_for(duration); }
@@ -285,6 +300,19 @@ TEST_F(EndToEndTest, ATerminatedReporterStillTellsWhatTheDevicesDid)
 
     ASSERT_TRUE(comes("kesto.Cavlet.Simple"));
     EXPECT_GT(std::stoi(values("kesto.Cavlet.Simple", "pipewire_Tx_null-sink_Simple_cycles").at(0)), 20);
+}
+
+TEST_F(EndToEndTest, AnIdleReporterWakesForNothing)
+{
+#ifdef __SANITIZE_THREAD__
+    GTEST_SKIP() << "the sanitizer has a thread of its own that does not rest";
+#endif
+    ASSERT_TRUE(reporterSays("connected to the reporting service"));
+    auto before = reporterSleeps();
+    for (std::uint64_t earlier = 0; earlier != before; earlier = std::exchange(before, reporterSleeps()))
+        letItPlay(500ms); // until what is told at the beginning has been told
+    letItPlay(2500ms); // more than twice as long as publishers rest unless they are told to rest for longer
+    EXPECT_EQ(reporterSleeps(), before);
 }
 
 TEST_F(EndToEndTest, AServiceThatIsKilledIsToldTheStateAgainWhenItIsBack)
