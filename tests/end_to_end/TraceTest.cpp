@@ -9,6 +9,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <kesto/trace.hpp>
+#include <kesto/trace_parameters.h>
 
 namespace end_to_end {
 namespace {
@@ -39,10 +40,13 @@ std::string point(const std::string& name, std::uint32_t begin, std::uint32_t en
         std::snprintf(digits, sizeof digits, "0x%08x", code);
         return std::string(digits);
     };
-    return "<dict><key>Name</key><string>" + name
-        + "</string><key>Type</key><string>Interval</string><key>KTraceCodeBegin</key><string>" + text(begin)
-        + "</string><key>KTraceCodeEnd</key><string>" + text(end)
-        + "</string><key>EventsMatchedBy</key><string>Thread</string></dict>";
+    const auto entry = [](std::string_view key, std::string_view value) {
+        return "<key>" + std::string(key) + "</key><string>" + std::string(value) + "</string>";
+    };
+    return "<dict>" + entry(KESTO_TRACE_POINT_DESCRIPTION, name)
+        + entry(KESTO_TRACE_POINT_TYPE, KESTO_TRACE_POINT_TYPE_INTERVAL)
+        + entry(KESTO_TRACE_POINT_BEGIN_CODE, text(begin)) + entry(KESTO_TRACE_POINT_END_CODE, text(end))
+        + entry(KESTO_TRACE_POINT_EVENTS_MATCHED_BY, KESTO_TRACE_POINT_EVENTS_MATCHED_BY_THREAD) + "</dict>";
 }
 
 std::string parameters()
@@ -50,8 +54,9 @@ std::string parameters()
     std::string points = point("shared", sharedBegin, sharedEnd);
     for (unsigned thread = 0; thread < threadCount; ++thread)
         points += point("thread " + std::to_string(thread), ownBegin(thread), ownBegin(thread) + 4);
-    return "<plist version=\"1.0\"><dict><key>Children</key><array><dict><key>Name</key><string>test</string>"
-           "<key>Children</key><array>"
+    return "<plist version=\"1.0\"><dict><key>" KESTO_TRACE_PARAM_CHILDREN_NODES "</key><array><dict>"
+           "<key>" KESTO_TRACE_DATA_DESCRIPTION "</key><string>test</string>"
+           "<key>" KESTO_TRACE_DATA_CHILDREN_NODES "</key><array>"
         + points + "</array></dict></array></dict></plist>";
 }
 
@@ -242,6 +247,50 @@ TEST_F(TraceTest, MeasuresNothingThatWasEmittedBeforeItsStartOrAfterItsEnd)
     stopSession();
     emit(sharedEnd);
     EXPECT_THAT(results("shared"), SizeIs(1));
+}
+
+TEST_F(TraceTest, EndsTheServiceWithStatusOneWhenItsResultsCannotBeWritten)
+{
+    if (!startSession()) {
+        ASSERT_NE(missing(), "");
+        GTEST_SKIP() << missing();
+    }
+    std::filesystem::create_directories(resultsPath);
+    session->call(Stop, reporter);
+    EXPECT_EQ(kestod.exitStatus(), 1);
+    EXPECT_EQ(kestod.countInLog(resultsPath.native() + " is a directory: remove it\n"), 1U);
+    EXPECT_TRUE(kestod.log().ends_with("Failed to open quilldat writer\n")) << "nothing is said after it";
+}
+
+TEST_F(TraceTest, MeasuresAgainWhenTheServiceWasKilledDuringATrace)
+{
+    kesto::Client client;
+    kesto::Options options;
+    options.socketPath = kestod.socketPath();
+    options.trace = true;
+    options.reconnect = true;
+    ASSERT_EQ(client.open(options), kesto::Status::Ok);
+    const kesto::Tracer tracer(client);
+
+    if (!startSession()) {
+        ASSERT_NE(missing(), "");
+        GTEST_SKIP() << missing();
+    }
+    ASSERT_TRUE(waitUntil([&] { return tracer.isActive(); }));
+    tracer.emit(sharedBegin);
+    kestod.kill();
+    EXPECT_TRUE(waitUntil([&] { return !tracer.isActive(); })) << "nobody reads what is emitted now";
+    EXPECT_FALSE(std::filesystem::exists(resultsPath));
+
+    kestod.start();
+    session.emplace(kestod.socketPath());
+    ASSERT_TRUE(startSession());
+    ASSERT_TRUE(waitUntil([&] { return tracer.isActive(); })) << "the client has connected again";
+    tracer.emit(sharedEnd); // of an interval that began in another life
+    const Bounds bounds = emitInterval(tracer, sharedBegin, sharedEnd, std::chrono::microseconds(500));
+    stopSession();
+    expectWithin(results("shared"), {bounds});
+    EXPECT_EQ(kestod.countInLog("there is no kernel trace"), 0U) << "it is taken over";
 }
 
 } // namespace
