@@ -26,8 +26,8 @@ std::vector<trace_point> eventsOf(std::size_t count, std::uint64_t threads)
     std::vector<trace_point> events(count);
     for (std::size_t number = 0; number < count; ++number)
         events[number] = {.timestamp = 1'000'000 + 500 * number,
-                          .thread = 4000 + number % threads,
-                          .code = number / threads % 2 == 0 ? beginCode : endCode};
+                          .threadID = 4000 + number % threads,
+                          .eventCode = number / threads % 2 == 0 ? beginCode : endCode};
     return events;
 }
 

@@ -10,14 +10,26 @@
 
 namespace platform {
 
-// One event as the kernel recorded it.
+// A time of day, since the beginning of 1970.
+struct KernelTraceWallTime {
+    std::int64_t seconds = 0;
+    std::int32_t microseconds = 0;
+
+    friend bool operator==(const KernelTraceWallTime&, const KernelTraceWallTime&) = default;
+};
+
+// One event as the kernel recorded it. Plain data of a fixed layout, copied whole.
 struct KernelTraceEvent {
     std::uint64_t timestamp = 0; // in the session's own unit; `timestampToNanoseconds` converts
-    std::uint64_t thread = 0;
-    std::uint32_t code = 0;
-    std::uint32_t cpu = 0;
     std::array<std::uint64_t, 4> arguments{};
+    std::uint64_t threadID = 0;
+    std::uint32_t eventCode = 0;
+    std::uint32_t cpu = 0;
+    KernelTraceWallTime wallTime{}; // 0 in sessions that did not enable it
+    std::array<const char*, 2> texts{}; // for systems whose events carry text and a number beside their arguments
+    std::int32_t value = 0;
 };
+static_assert(sizeof(void*) != 8 || sizeof(KernelTraceEvent) == 96);
 
 // One trace session. Its handlers run on the queue that `start` was given, in the order of time.
 //
@@ -28,6 +40,7 @@ public:
     virtual ~KernelTraceSession() = default;
     // Runs once, after the session ended and everything was delivered.
     virtual void setCompletionHandler(std::function<void()> handler) = 0;
+    // Whether events are to carry their wall-clock time. Before `start`; at first they do not.
     virtual void enableWallTimes(bool enabled) = 0;
     // 0 or an error number, here and in `start`.
     virtual int filterEventRange(std::uint32_t firstCode, std::uint32_t lastCode,

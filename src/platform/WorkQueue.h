@@ -36,6 +36,7 @@ public:
 class WorkQueues {
 public:
     virtual ~WorkQueues() = default;
+    // Throws std::system_error when there is no thread left for it.
     [[nodiscard]] virtual std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name,
                                                                      QualityOfService quality) = 0;
     // The process's concurrent queue of background priority.

@@ -19,8 +19,9 @@ void Trace::processTracepoints(const platform::KernelTraceSession& session, std:
         eventsRead += events.size();
     }
     if (leftOut != 0)
-        KESTO_LOG(KestoReportingTraceCategory(), Error, "trace {} has {} results; {} of its intervals are left out",
-                  name_, results, leftOut);
+        KESTO_LOG(KestoReportingTraceCategory(), Error,
+                  "trace {} has read {} events and has {} results; {} of its intervals are left out", name_, eventsRead,
+                  results, leftOut);
 }
 
 TraceResults Trace::getResults()

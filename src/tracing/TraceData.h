@@ -40,6 +40,9 @@ protected:
     explicit TraceData(std::string name) : name_(std::move(name)) { }
 
     void addResult(std::uint64_t result) { results_.push_back(result); }
+    // Makes room for so many more, so that adding them does not move those that are there; and gives back what is left.
+    void makeRoom(std::size_t more) { results_.reserve(results_.size() + more); }
+    void giveBackRoom() { results_.shrink_to_fit(); }
     void countCompletedInterval() { ++numTimesTraced_; }
 
 private:

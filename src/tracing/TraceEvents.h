@@ -12,7 +12,7 @@
 class TraceEvents {
 public:
     static constexpr std::size_t firstRoom = 10'000; // in events
-    // Beyond the first room of each: some 56 MB.
+    // Beyond the first room of each: some 96 MB.
     static constexpr std::size_t mostOfAllTraces = 1'000'000;
 
     TraceEvents() { events_.reserve(firstRoom); }

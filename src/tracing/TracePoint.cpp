@@ -7,6 +7,6 @@ void TracePoint::processTracepoints(const platform::KernelTraceSession&, std::sp
     if (index >= trace_point().arguments.size())
         return;
     for (const trace_point& event : events)
-        if (event.code == beginCode_)
+        if (event.eventCode == beginCode_)
             addResult(event.arguments[index]);
 }

@@ -21,6 +21,7 @@ constexpr std::uint32_t clientCreate = 0x21044814;
 constexpr std::uint32_t clientStart = 0x21044818;
 constexpr std::uint32_t clientStop = 0x2104481C;
 constexpr std::uint32_t clientDestroy = 0x21044820;
+constexpr std::uint32_t clientSendMessage = 0x21044824;
 constexpr std::uint32_t sessionCreated = 0x21044828;
 constexpr std::uint32_t sessionStarted = 0x2104482C;
 constexpr std::uint32_t sessionStopping = 0x21044830;
@@ -107,6 +108,45 @@ TEST_F(ClientTest, ServesCallsInTheOrderInWhichTheyCame)
     const auto asked = player.submit(GetServiceNameForReporterID, {42});
     platform.workQueues.runAll();
     EXPECT_EQ(player.answersTo(asked), answeredOnce({null, 4}));
+}
+
+TEST_F(ClientTest, SaysWhatIsCalledBeforeItMarksIt)
+{
+    struct Row {
+        Method method;
+        Array arguments;
+        std::vector<std::string> firstSteps;
+    };
+    const auto mark = [](std::uint32_t code) { return std::to_string(code); };
+    const std::vector<Row> rows{
+        {CreateReportingSession,
+         {42},
+         {"creating session for reporter 42", mark(clientCreate), "created reporting session for ID: 42",
+          mark(sessionCreated), "session created for reporter 42"}},
+        {StartReportingSessionForID,
+         {42},
+         {"starting session for reporter 42", mark(clientStart), "starting session owned by 42", mark(sessionStarted)}},
+        {SendMessage,
+         {Dictionary{{"a", 1}}, 4, 1, Array{42}},
+         {"sending message for reporter [42]", mark(clientSendMessage)}},
+        {StopReportingSessionForID, {42}, {"stopping session for reporter 42", mark(clientStop)}},
+        {DestroyReportingSession,
+         {42},
+         {"destroying session for reporter 42", mark(clientDestroy), mark(sessionDestroyed),
+          "deallocing this session 42", "destroying 42"}}};
+    std::vector<std::string> steps;
+    platform.log.setObserver([&](const LogLine& line) { steps.push_back(line.message); });
+    platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
+    for (const auto& [method, arguments, firstSteps] : rows) {
+        steps.clear();
+        player.submit(method, arguments);
+        platform.workQueues.runAll();
+        ASSERT_GE(steps.size(), firstSteps.size());
+        steps.resize(firstSteps.size());
+        EXPECT_EQ(steps, firstSteps);
+    }
+    platform.log.setObserver(nullptr);
+    platform.traceMarkers.setObserver(nullptr);
 }
 
 // --- create

@@ -67,6 +67,19 @@ TEST_F(SessionTest, SaysAndMarksThatItGoes)
     EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));
 }
 
+TEST_F(SessionTest, SaysThatItWasMadeBeforeItMarksItAndMarksThatItGoesBeforeItSaysIt)
+{
+    std::vector<std::string> steps;
+    platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
+    platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
+    session = std::make_shared<KestoReportingSession>(43, std::vector<std::int32_t>{7}); // 42 goes
+    platform.log.setObserver(nullptr);
+    platform.traceMarkers.setObserver(nullptr);
+    EXPECT_THAT(steps,
+                ElementsAre("created reporting session for ID: 43", std::to_string(created), std::to_string(destroyed),
+                            "deallocing this session 42"));
+}
+
 TEST_F(SessionTest, GoesWithoutStoppingWhenItIsLetGoOfWhileStarted)
 {
     session->start();

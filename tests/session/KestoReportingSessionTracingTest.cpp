@@ -48,8 +48,8 @@ protected:
     // Emits an interval of that length.
     void emit(std::uint64_t length)
     {
-        platform.kernelTrace.deliver({.timestamp = 1000, .thread = 1, .code = 0x21040010});
-        platform.kernelTrace.deliver({.timestamp = 1000 + length, .thread = 1, .code = 0x21040014});
+        platform.kernelTrace.deliver({.timestamp = 1000, .threadID = 1, .eventCode = 0x21040010});
+        platform.kernelTrace.deliver({.timestamp = 1000 + length, .threadID = 1, .eventCode = 0x21040014});
     }
     [[nodiscard]] std::size_t tracesStarted() const { return platform.kernelTrace.sessions().size(); }
     [[nodiscard]] std::size_t filesWritten() const { return platform.performanceWriter.files().size(); }
@@ -242,6 +242,33 @@ TEST_F(SessionTracing, DoesNotStartWhenTooManyOthersRunWhichIsSaid)
     others.pop_back();
     session->start();
     EXPECT_TRUE(session->startedTracing());
+}
+
+TEST_F(SessionTracing, DoesNotStartWithoutAThreadForItWhichIsSaid)
+{
+    platform.workQueues.hasThreads = false;
+    session->start();
+    EXPECT_TRUE(session->started());
+    EXPECT_FALSE(session->startedTracing());
+    EXPECT_EQ(session->tracingFileName(), std::nullopt);
+    EXPECT_EQ(session->traceParams(), nullptr);
+    EXPECT_EQ(session->traceRunner(), nullptr);
+    EXPECT_EQ(TraceRunner::numberOfRunners(), 0U);
+    EXPECT_EQ(tracesStarted(), 0U);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42"),
+                            IsLine(Debug, "kerr", "Got the tracefile /traces/mix.plist, setting up trace"),
+                            IsLine(Error, "kerr", "session 42 is not traced: Resource temporarily unavailable")));
+    platform.log.clear();
+    session->stop();
+    EXPECT_FALSE(session->started());
+    EXPECT_EQ(filesWritten(), 0U);
+    for (const support::LogLine& line : lines())
+        EXPECT_NE(line.level, Error) << line.message;
+
+    platform.workQueues.hasThreads = true;
+    session->start();
+    EXPECT_TRUE(session->startedTracing()) << "the next run may have one";
 }
 
 // --- stopping

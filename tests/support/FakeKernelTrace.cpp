@@ -46,13 +46,16 @@ private:
     const std::shared_ptr<Session> session_;
 };
 
-void FakeKernelTrace::deliver(const platform::KernelTraceEvent& event)
+void FakeKernelTrace::deliver(platform::KernelTraceEvent event)
 {
-    for (const auto& session : sessions_)
+    const platform::KernelTraceWallTime wallTime = event.wallTime;
+    for (const auto& session : sessions_) {
+        event.wallTime = session->wallTimes ? wallTime : platform::KernelTraceWallTime();
         for (const auto& [firstCode, lastCode, handler] : session->filters)
-            if (session->started && !session->ended && !session->destroyed && event.code >= firstCode
-                && event.code <= lastCode)
+            if (session->started && !session->ended && !session->destroyed && event.eventCode >= firstCode
+                && event.eventCode <= lastCode)
                 session->queue->submit([handler, event] { handler(event); });
+    }
 }
 
 std::unique_ptr<platform::KernelTraceSession> FakeKernelTrace::createTraceSession()

@@ -38,8 +38,9 @@ public:
 
     // The sessions that were made, in order.
     [[nodiscard]] const std::vector<std::shared_ptr<Session>>& sessions() const { return sessions_; }
-    // Delivers the event to every running session that filters for its code.
-    void deliver(const platform::KernelTraceEvent& event);
+    // Delivers the event to every running session that filters for its code; with its wall-clock time to those that
+    // enabled it.
+    void deliver(platform::KernelTraceEvent event);
 
     bool isAvailable() override { return available; }
     std::unique_ptr<platform::KernelTraceSession> createTraceSession() override;

@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <stdexcept>
+#include <system_error>
 #include <utility>
 
 namespace support {
@@ -102,6 +103,8 @@ void FakeWorkQueues::discardAll()
 std::shared_ptr<platform::WorkQueue> FakeWorkQueues::makeSerialQueue(std::string_view name,
                                                                      platform::QualityOfService quality)
 {
+    if (!hasThreads)
+        throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again));
     made_.push_back({std::string(name), quality});
     return std::make_shared<Queue>(*this, true);
 }

@@ -24,6 +24,9 @@ public:
         friend bool operator==(const MadeQueue&, const MadeQueue&) = default;
     };
 
+    // Whether there are threads for more serial queues.
+    bool hasThreads = true;
+
     explicit FakeWorkQueues(FakeClock& clock);
     ~FakeWorkQueues() override;
     FakeWorkQueues(const FakeWorkQueues&) = delete;
@@ -44,6 +47,7 @@ public:
     // The serial queues that were made, in order.
     [[nodiscard]] const std::vector<MadeQueue>& made() const { return made_; }
 
+    // Throws as a thread does that cannot be started.
     std::shared_ptr<platform::WorkQueue> makeSerialQueue(std::string_view name,
                                                          platform::QualityOfService quality) override;
     platform::WorkQueue& backgroundQueue() override;

@@ -7,7 +7,7 @@ namespace support {
 
 inline trace_point eventOf(std::uint32_t code, std::uint64_t timestamp, std::uint64_t thread = 1)
 {
-    return {.timestamp = timestamp, .thread = thread, .code = code};
+    return {.timestamp = timestamp, .threadID = thread, .eventCode = code};
 }
 
 } // namespace support

@@ -260,15 +260,15 @@ Measured measureNaively(const Events& events, std::uint32_t first, std::uint32_t
     Measured measured;
     for (std::size_t at = 0; at < events.size(); ++at) {
         const trace_point& event = events[at];
-        if (event.code != first && event.code != last)
+        if (event.eventCode != first && event.eventCode != last)
             continue;
         const trace_point* before = nullptr;
         for (std::size_t earlier = 0; earlier < at; ++earlier)
-            if ((events[earlier].code == first || events[earlier].code == last)
-                && (!byThread || events[earlier].thread == event.thread))
+            if ((events[earlier].eventCode == first || events[earlier].eventCode == last)
+                && (!byThread || events[earlier].threadID == event.threadID))
                 before = &events[earlier];
-        const bool isOpen = before != nullptr && before->code == first && (byThread || before->timestamp != 0);
-        if (event.code == first)
+        const bool isOpen = before != nullptr && before->eventCode == first && (byThread || before->timestamp != 0);
+        if (event.eventCode == first)
             measured.startDiscards += isOpen ? 1 : 0;
         else if (isOpen)
             measured.results.push_back(event.timestamp - before->timestamp);

@@ -208,6 +208,19 @@ TEST_F(Runner, WritesAnEmptyFileWithoutTraces)
     EXPECT_TRUE(file().closed);
 }
 
+TEST_F(Runner, CompletesATraceThatWasNeverRun)
+{
+    add(interval("one", "interval"));
+    runner->stopTracingandProcessResults();
+    EXPECT_EQ(runner->completedTraceCount(), 1U);
+    EXPECT_THAT(platform.kernelTrace.sessions(), IsEmpty());
+    EXPECT_THAT(messages(),
+                ElementsAre("Tearing down trace :  one", "Completed trace.... 1,   1 ",
+                            "Completed trace....In write perf data.... 1"));
+    EXPECT_THAT(file().measurements, IsEmpty());
+    EXPECT_TRUE(file().closed);
+}
+
 // --- what goes wrong
 
 TEST_F(Runner, SaysThatARangeCannotBeSetUpAndStartsAllTheSame)

@@ -26,9 +26,9 @@ protected:
 
     std::vector<std::uint64_t> process(TracePoint& point)
     {
-        const Events events{{.timestamp = 1, .code = code, .arguments = {11, 12, 13, 14}},
-                            {.timestamp = 2, .code = code + 1, .arguments = {21, 22, 23, 24}},
-                            {.timestamp = 3, .code = code, .arguments = {31, 32, 33, 34}}};
+        const Events events{{.timestamp = 1, .arguments = {11, 12, 13, 14}, .eventCode = code},
+                            {.timestamp = 2, .arguments = {21, 22, 23, 24}, .eventCode = code + 1},
+                            {.timestamp = 3, .arguments = {31, 32, 33, 34}, .eventCode = code}};
         point.processTracepoints(*kernelTrace.createTraceSession(), events);
         return point.getResults();
     }
@@ -133,7 +133,8 @@ TEST_F(TraceTest, LeavesOutWhatItWouldMeasureBeyondAMillionResultsAndSaysSo)
     EXPECT_THAT(trace.getResults(), ElementsAre(Pair("0", SizeIs(each)), Pair("1", SizeIs(each))));
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(support::IsLine(platform::LogLevel::Error, "kert",
-                                            "trace startup has 1000000 results; 3 of its intervals are left out")));
+                                            "trace startup has read 2000000 events and has 1000000 results; 3 of its "
+                                            "intervals are left out")));
 }
 
 TEST_F(TraceTest, LeavesOutIntervalsThatWouldReadMoreEventsThanTheServiceMayWaitFor)
@@ -145,7 +146,8 @@ TEST_F(TraceTest, LeavesOutIntervalsThatWouldReadMoreEventsThanTheServiceMayWait
     process(Events(count, eventOf(3, 1)));
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(support::IsLine(platform::LogLevel::Error, "kert",
-                                            "trace startup has 0 results; 2 of its intervals are left out")));
+                                            "trace startup has read 50000000 events and has 0 results; 2 of its "
+                                            "intervals are left out")));
 }
 
 // --- the events of a trace

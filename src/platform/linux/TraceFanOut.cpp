@@ -3,6 +3,7 @@
 #include "platform/linux/TraceFanOut.h"
 
 #include <algorithm>
+#include <chrono>
 #include <utility>
 
 namespace platform {
@@ -33,13 +34,13 @@ std::uint64_t TraceFanOut::nextEnd() const noexcept
     return end;
 }
 
-void TraceFanOut::deliver(std::span<const KernelTraceEvent> events, std::uint64_t doneUpTo, std::uint64_t lost)
+void TraceFanOut::deliver(std::span<const TracedMarker> events, std::uint64_t doneUpTo, std::uint64_t lost)
 {
     for (const Subscription& subscription : subscriptions_) {
         subscription->lost += lost;
-        const auto begin = std::ranges::lower_bound(events, subscription->startTime, {}, &KernelTraceEvent::timestamp);
+        const auto begin = std::ranges::lower_bound(events, subscription->startTime, {}, &TracedMarker::timestamp);
         const auto end =
-            std::ranges::upper_bound(begin, events.end(), subscription->endTime, {}, &KernelTraceEvent::timestamp);
+            std::ranges::upper_bound(begin, events.end(), subscription->endTime, {}, &TracedMarker::timestamp);
         submit(subscription, {begin, end});
         if (subscription->hasEnded() && subscription->endTime <= doneUpTo)
             complete(subscription);
@@ -48,12 +49,13 @@ void TraceFanOut::deliver(std::span<const KernelTraceEvent> events, std::uint64_
                   [&](const Subscription& each) { return each->hasEnded() && each->endTime <= doneUpTo; });
 }
 
-void TraceFanOut::submit(const Subscription& subscription, std::span<const KernelTraceEvent> events)
+void TraceFanOut::submit(const Subscription& subscription, std::span<const TracedMarker> events)
 {
     std::vector<KernelTraceEvent> wanted;
-    for (const KernelTraceEvent& event : events)
-        if (std::ranges::any_of(subscription->filters, [&](const auto& each) { return each.accepts(event.code); }))
-            wanted.push_back(event);
+    for (const TracedMarker& event : events)
+        if (std::ranges::any_of(subscription->filters,
+                                [&](const auto& each) { return each.accepts(event.record.code); }))
+            wanted.push_back(eventFor(*subscription, event));
     if (wanted.empty())
         return;
     if (const std::size_t before = onTheirWay_->load(); before + wanted.size() > mostOnTheirWay) {
@@ -65,10 +67,29 @@ void TraceFanOut::submit(const Subscription& subscription, std::span<const Kerne
     subscription->queue->submit([subscription, onTheirWay = onTheirWay_, wanted = std::move(wanted)] {
         for (const KernelTraceEvent& event : wanted)
             for (const auto& filter : subscription->filters)
-                if (filter.accepts(event.code) && !subscription->isDestroyed.load(std::memory_order_relaxed))
+                if (filter.accepts(event.eventCode) && !subscription->isDestroyed.load(std::memory_order_relaxed))
                     filter.handler(event);
         *onTheirWay -= wanted.size();
     });
+}
+
+KernelTraceEvent TraceFanOut::eventFor(const TraceSubscription& subscription, const TracedMarker& event) const
+{
+    return {.timestamp = event.timestamp,
+            .arguments = event.record.arguments,
+            .threadID = event.threadID,
+            .eventCode = event.record.code,
+            .cpu = event.cpu,
+            .wallTime = subscription.hasWallTimes ? wallTime(event.timestamp) : KernelTraceWallTime()};
+}
+
+KernelTraceWallTime TraceFanOut::wallTime(std::uint64_t timestamp) const
+{
+    using namespace std::chrono;
+    const nanoseconds time(static_cast<std::int64_t>(timestamp + static_cast<std::uint64_t>(wallClockAhead_)));
+    const auto second = floor<seconds>(time);
+    return {.seconds = second.count(),
+            .microseconds = static_cast<std::int32_t>(floor<microseconds>(time - second).count())};
 }
 
 void TraceFanOut::complete(const Subscription& subscription) const

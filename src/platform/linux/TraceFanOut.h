@@ -6,6 +6,7 @@
 
 #include "platform/KernelTrace.h"
 #include "platform/linux/ProviderLog.h"
+#include "platform/linux/TracedMarker.h"
 
 #include <atomic>
 #include <cstddef>
@@ -33,6 +34,7 @@ struct TraceSubscription {
     std::vector<Filter> filters;
     std::function<void()> completion;
     std::shared_ptr<WorkQueue> queue;
+    bool hasWallTimes = false; // wants them
     std::uint64_t startTime = never; // the first moment that belongs to it
     std::uint64_t endTime = never; // the last one
     std::uint64_t lost = 0; // events; perhaps none of them its own
@@ -62,19 +64,24 @@ public:
     // The earliest end of those that have ended and are not completed; TraceSubscription::never without one.
     [[nodiscard]] std::uint64_t nextEnd() const noexcept;
 
+    // How many nanoseconds the wall clock is ahead of the trace's, for what is delivered from now on.
+    void setWallClock(std::int64_t ahead) noexcept { wallClockAhead_ = ahead; }
     // Delivers events, which are in the order of time. Up to `doneUpTo` there will not be any more: sessions that ended
     // by then are completed, and leave. What was lost meanwhile counts for all.
-    void deliver(std::span<const KernelTraceEvent> events, std::uint64_t doneUpTo, std::uint64_t lost);
+    void deliver(std::span<const TracedMarker> events, std::uint64_t doneUpTo, std::uint64_t lost);
     // Has a session told that it is complete. `deliver` does it for all that were added.
     void complete(const std::shared_ptr<TraceSubscription>& subscription) const;
 
 private:
     using Subscription = std::shared_ptr<TraceSubscription>;
 
-    void submit(const Subscription& subscription, std::span<const KernelTraceEvent> events);
+    void submit(const Subscription& subscription, std::span<const TracedMarker> events);
+    [[nodiscard]] KernelTraceEvent eventFor(const TraceSubscription& subscription, const TracedMarker& event) const;
+    [[nodiscard]] KernelTraceWallTime wallTime(std::uint64_t timestamp) const;
 
     const ProviderLog log_;
     std::vector<Subscription> subscriptions_;
+    std::int64_t wallClockAhead_ = 0;
     const std::shared_ptr<std::atomic<std::size_t>> onTheirWay_ = std::make_shared<std::atomic<std::size_t>>(0);
 };
 

@@ -2,8 +2,6 @@
 // good as nothing where one processor does all the work.
 #include "platform/linux/TraceMerger.h"
 
-#include "platform/linux/TraceMarker.h"
-
 #include <algorithm>
 #include <utility>
 
@@ -22,7 +20,7 @@ template <typename Number> Number numberAt(std::span<const std::byte> bytes, std
     return number;
 }
 
-bool isBefore(const KernelTraceEvent& left, const KernelTraceEvent& right)
+bool isBefore(const TracedMarker& left, const TracedMarker& right)
 {
     return left.timestamp < right.timestamp;
 }
@@ -47,7 +45,7 @@ void TraceMerger::take(std::uint32_t cpu, std::span<const std::byte> page)
     losses_ += reader.isBroken() ? 1 : 0;
 }
 
-void TraceMerger::add(std::vector<KernelTraceEvent>& stream, std::uint32_t cpu, const TraceRecord& record)
+void TraceMerger::add(std::vector<TracedMarker>& stream, std::uint32_t cpu, const TraceRecord& record)
 {
     const bool isLate =
         record.timestamp <= doneUpTo_ || (!stream.empty() && record.timestamp < stream.back().timestamp);
@@ -56,22 +54,20 @@ void TraceMerger::add(std::vector<KernelTraceEvent>& stream, std::uint32_t cpu, 
         return;
     }
     ++waiting_;
-    KernelTraceEvent& event = stream.emplace_back();
+    TracedMarker& event = stream.emplace_back();
     event.timestamp = record.timestamp;
-    event.thread = numberAt<std::uint32_t>(record.bytes, threadOffset);
-    const auto marker = numberAt<TraceMarkerRecord>(record.bytes, markerOffset);
-    event.code = marker.code;
+    event.threadID = numberAt<std::uint32_t>(record.bytes, threadOffset);
     event.cpu = cpu;
-    event.arguments = marker.arguments;
+    event.record = numberAt<TraceMarkerRecord>(record.bytes, markerOffset);
 }
 
-std::span<const KernelTraceEvent> TraceMerger::eventsUpTo(std::uint64_t time)
+std::span<const TracedMarker> TraceMerger::eventsUpTo(std::uint64_t time)
 {
     doneUpTo_ = std::max(doneUpTo_, time);
     merged_.clear();
     runs_.assign(1, 0);
     for (auto& stream : streams_) {
-        const auto end = std::ranges::upper_bound(stream, doneUpTo_, {}, &KernelTraceEvent::timestamp);
+        const auto end = std::ranges::upper_bound(stream, doneUpTo_, {}, &TracedMarker::timestamp);
         if (end == stream.begin())
             continue;
         merged_.insert(merged_.end(), stream.begin(), end);

@@ -5,8 +5,8 @@
 // call of `eventsUpTo`. What comes in spite of it is lost rather than told in the wrong order.
 #pragma once
 
-#include "platform/KernelTrace.h"
 #include "platform/linux/TracePage.h"
+#include "platform/linux/TracedMarker.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -31,7 +31,7 @@ public:
 
     // The events up to that time, it included, that were not handed out before: in the order of time, those of one
     // time in the order of the processors. Valid until the next call.
-    [[nodiscard]] std::span<const KernelTraceEvent> eventsUpTo(std::uint64_t time);
+    [[nodiscard]] std::span<const TracedMarker> eventsUpTo(std::uint64_t time);
 
     // How many events were lost since the last call: in the kernel, in pages that make no sense (one each), for want
     // of room here, and because they came too late.
@@ -40,13 +40,13 @@ public:
 private:
     [[nodiscard]] bool isMarker(std::span<const std::byte> record) const noexcept;
     void mergeNeighbours();
-    void add(std::vector<KernelTraceEvent>& stream, std::uint32_t cpu, const TraceRecord& record);
+    void add(std::vector<TracedMarker>& stream, std::uint32_t cpu, const TraceRecord& record);
 
     const TracePageFormat format_;
     const std::uint16_t recordType_;
-    std::vector<std::vector<KernelTraceEvent>> streams_; // one a processor, each in the order of time
-    std::vector<KernelTraceEvent> merged_;
-    std::vector<KernelTraceEvent> merging_; // what becomes of it
+    std::vector<std::vector<TracedMarker>> streams_; // one a processor, each in the order of time
+    std::vector<TracedMarker> merged_;
+    std::vector<TracedMarker> merging_; // what becomes of it
     std::vector<std::size_t> runs_; // where the parts of `merged_` begin that are in order, and its end
     std::size_t waiting_ = 0;
     std::uint64_t doneUpTo_ = 0;

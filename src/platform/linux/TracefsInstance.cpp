@@ -138,12 +138,12 @@ std::expected<void, TracefsFailure> TracefsInstance::setUp(const fs::path& path)
     for (const auto& [name, text] : {std::pair{"tracing_on", "0"}, {"trace_clock", "mono"}, {"trace", ""}})
         if (const int error = writeAt(directory_, name, text); error != 0)
             return std::unexpected(failure(path / name, "cannot be written", error));
+    page_.resize(pageSize(path));
     if (const auto read = readFormats(path); !read)
         return read;
     marker_ = openAt(directory_, "trace_marker_raw", O_WRONLY);
     if (!marker_)
         return std::unexpected(failure(path / "trace_marker_raw", "cannot be opened", errno));
-    page_.resize(pageSize(path));
     return openPages(path);
 }
 
@@ -159,7 +159,7 @@ std::expected<void, TracefsFailure> TracefsInstance::readFormats(const fs::path&
     const auto dataOffset = numberBehind(page, "char data;\toffset:");
     const auto commitSize = numberBehind(page, "commit;\toffset:8;\tsize:");
     if (!dataOffset || (commitSize != 4U && commitSize != 8U)
-        || *dataOffset < TracePageFormat::commitOffset + *commitSize || *dataOffset > page_.max_size())
+        || *dataOffset < TracePageFormat::commitOffset + *commitSize || *dataOffset >= page_.size())
         return unexpectedFormat(path / "events/header_page");
     pageFormat_ = {.commitSize = *commitSize, .dataOffset = *dataOffset};
 

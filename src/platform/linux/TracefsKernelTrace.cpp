@@ -27,6 +27,13 @@ Clock::time_point moment(std::uint64_t traceTime)
     return Clock::time_point(std::chrono::nanoseconds(traceTime));
 }
 
+// In nanoseconds. Looked at anew for every reading: it changes when the clock is set and when the machine has slept.
+std::int64_t wallClockAheadOfTrace()
+{
+    const auto wall = std::chrono::system_clock::now().time_since_epoch();
+    return std::chrono::nanoseconds(wall - Clock::now().time_since_epoch()).count();
+}
+
 } // namespace
 
 class TracefsKernelTrace::Session final : public KernelTraceSession {
@@ -42,8 +49,11 @@ public:
         subscription_->completion = std::move(handler);
     }
 
-    // Times are the monotonic clock's; events have no room for others.
-    void enableWallTimes(bool) override { }
+    void enableWallTimes(bool enabled) override
+    {
+        assert(!subscription_->queue);
+        subscription_->hasWallTimes = enabled;
+    }
 
     int filterEventRange(std::uint32_t firstCode, std::uint32_t lastCode,
                          std::function<void(const KernelTraceEvent&)> handler) override
@@ -248,6 +258,7 @@ void TracefsKernelTrace::read()
     instance_->readPages([&merger](std::uint32_t cpu, std::span<const std::byte> page) { merger.take(cpu, page); });
     const std::uint64_t settled = traceTime(lastReading_ - settlingTime);
     const auto events = merger.eventsUpTo(settled);
+    fanOut_.setWallClock(wallClockAheadOfTrace());
     fanOut_.deliver(events, settled, merger.takeLosses());
 }
 

@@ -34,8 +34,10 @@ private:
 struct Listener {
     explicit Listener(std::uint64_t start, std::uint32_t firstCode = 0, std::uint32_t lastCode = UINT32_MAX)
     {
-        subscription->filters.push_back(
-            {firstCode, lastCode, [this](const KernelTraceEvent& event) { times.push_back(event.timestamp); }});
+        subscription->filters.push_back({firstCode, lastCode, [this](const KernelTraceEvent& event) {
+                                             times.push_back(event.timestamp);
+                                             last = event;
+                                         }});
         subscription->completion = [this] { completedAfter.push_back(times.size()); };
         subscription->queue = queue;
         subscription->startTime = start;
@@ -48,14 +50,15 @@ struct Listener {
     std::shared_ptr<HeldQueue> queue = std::make_shared<HeldQueue>();
     std::shared_ptr<TraceSubscription> subscription = std::make_shared<TraceSubscription>();
     std::vector<std::uint64_t> times;
+    KernelTraceEvent last;
     std::vector<std::size_t> completedAfter; // so many events
 };
 
-std::vector<KernelTraceEvent> eventsAt(std::initializer_list<std::uint64_t> times, std::uint32_t code = 1)
+std::vector<TracedMarker> eventsAt(std::initializer_list<std::uint64_t> times, std::uint32_t code = 1)
 {
-    std::vector<KernelTraceEvent> events;
+    std::vector<TracedMarker> events;
     for (const std::uint64_t time : times)
-        events.push_back({.timestamp = time, .code = code});
+        events.push_back({.timestamp = time, .record = {.code = code}});
     return events;
 }
 
@@ -79,6 +82,45 @@ TEST_F(TraceFanOutTest, GivesASessionWhatIsBetweenItsStartAndItsEndBothIncluded)
     EXPECT_THAT(listener.completedAfter, ElementsAre(4));
     EXPECT_TRUE(fanOut.isEmpty());
     EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(TraceFanOutTest, TellsASessionAllThatIsKnownOfAnEvent)
+{
+    Listener listener(1);
+    add(listener);
+    const TracedMarker event{
+        .timestamp = 7, .threadID = 4711, .cpu = 3, .record = {.code = 0x21040010, .arguments = {1, 2, 3, UINT64_MAX}}};
+    fanOut.deliver({&event, 1}, 10, 0);
+    listener.queue->run();
+    EXPECT_EQ(listener.last.timestamp, 7U);
+    EXPECT_EQ(listener.last.threadID, 4711U);
+    EXPECT_EQ(listener.last.eventCode, 0x21040010U);
+    EXPECT_EQ(listener.last.cpu, 3U);
+    EXPECT_THAT(listener.last.arguments, ElementsAre(1U, 2U, 3U, UINT64_MAX));
+}
+
+TEST_F(TraceFanOutTest, TellsTheTimeOfDayToSessionsThatWantIt)
+{
+    Listener with(1);
+    Listener without(1);
+    with.subscription->hasWallTimes = true;
+    add(with);
+    add(without);
+    const auto wallTimeOf = [&](std::uint64_t time) {
+        fanOut.deliver(eventsAt({time}), time, 0);
+        with.queue->run();
+        without.queue->run();
+        EXPECT_EQ(without.last.timestamp, time);
+        EXPECT_EQ(without.last.wallTime, KernelTraceWallTime());
+        return with.last.wallTime;
+    };
+    EXPECT_EQ(wallTimeOf(2'000'000'999), (KernelTraceWallTime{.seconds = 2, .microseconds = 0})) << "the clocks agree";
+    fanOut.setWallClock(1'700'000'000'999'998'000);
+    EXPECT_EQ(wallTimeOf(3'000'001'999), (KernelTraceWallTime{.seconds = 1'700'000'003, .microseconds = 999'999}));
+    EXPECT_EQ(wallTimeOf(3'000'002'000), (KernelTraceWallTime{.seconds = 1'700'000'004, .microseconds = 0}));
+    fanOut.setWallClock(-5'000'000'000);
+    EXPECT_EQ(wallTimeOf(4'250'000'000), (KernelTraceWallTime{.seconds = -1, .microseconds = 250'000}))
+        << "before 1970, the seconds are those before it, too";
 }
 
 TEST_F(TraceFanOutTest, CompletesASessionOnceNothingOfItsTimeCanComeAnyMore)
@@ -108,7 +150,7 @@ TEST_F(TraceFanOutTest, GivesEachSessionTheCodesThatItWants)
         add(*each);
     auto events = eventsAt({1}, 0);
     for (const std::uint32_t code : {9U, 10U, 19U, 20U})
-        events.push_back({.timestamp = code, .code = code});
+        events.push_back({.timestamp = code, .record = {.code = code}});
     fanOut.deliver(events, 100, 0);
     for (const Listener* each : {&low, &high, &both})
         each->queue->run();
@@ -124,8 +166,8 @@ TEST_F(TraceFanOutTest, CallsEveryFilterThatAnEventFits)
         {9, 12, [&](const KernelTraceEvent& event) { listener.times.push_back(1000 + event.timestamp); }});
     add(listener);
     auto events = eventsAt({1}, 5);
-    events.push_back({.timestamp = 2, .code = 9});
-    events.push_back({.timestamp = 3, .code = 12});
+    events.push_back({.timestamp = 2, .record = {.code = 9}});
+    events.push_back({.timestamp = 3, .record = {.code = 12}});
     fanOut.deliver(events, 100, 0);
     listener.queue->run();
     EXPECT_THAT(listener.times, ElementsAre(1, 2, 1002, 1003));
@@ -198,7 +240,7 @@ TEST_F(TraceFanOutTest, LosesWhatAQueueIsTooFarBehindWith)
     Listener listener(1);
     Listener other(1);
     add(listener);
-    std::vector<KernelTraceEvent> events(TraceFanOut::mostOnTheirWay - 1, {.timestamp = 1});
+    std::vector<TracedMarker> events(TraceFanOut::mostOnTheirWay - 1, {.timestamp = 1});
     fanOut.deliver(events, 1, 0);
     add(other);
     fanOut.deliver(eventsAt({2, 3, 4}), 10, 0);
@@ -237,9 +279,9 @@ TEST_F(TraceFanOutTest, GivesAnySessionsWhatIsTheirs)
         cuts.push_back(1000);
         std::size_t done = 0;
         for (const std::uint64_t cut : cuts) {
-            std::vector<KernelTraceEvent> events;
+            std::vector<TracedMarker> events;
             for (; done < times.size() && times[done] <= cut; ++done)
-                events.push_back({.timestamp = times[done], .code = times[done] % 4U});
+                events.push_back({.timestamp = times[done], .record = {.code = times[done] % 4U}});
             fanOut.deliver(events, cut, 0);
         }
         for (const Listener& listener : listeners) {

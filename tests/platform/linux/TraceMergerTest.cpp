@@ -21,8 +21,8 @@ protected:
     std::vector<std::uint32_t> codesUpTo(std::uint64_t time)
     {
         std::vector<std::uint32_t> codes;
-        for (const KernelTraceEvent& event : merger.eventsUpTo(time))
-            codes.push_back(event.code);
+        for (const TracedMarker& event : merger.eventsUpTo(time))
+            codes.push_back(event.record.code);
         return codes;
     }
 
@@ -35,10 +35,10 @@ TEST_F(TraceMergerTest, TellsAllThatTheKernelKnowsOfAnEvent)
     const auto events = merger.eventsUpTo(10);
     ASSERT_EQ(events.size(), 1U);
     EXPECT_EQ(events[0].timestamp, 7U);
-    EXPECT_EQ(events[0].thread, 4711U);
-    EXPECT_EQ(events[0].code, 0x21040010U);
+    EXPECT_EQ(events[0].threadID, 4711U);
+    EXPECT_EQ(events[0].record.code, 0x21040010U);
     EXPECT_EQ(events[0].cpu, 3U);
-    EXPECT_THAT(events[0].arguments, ElementsAre(1U, 2U, 3U, UINT64_MAX));
+    EXPECT_THAT(events[0].record.arguments, ElementsAre(1U, 2U, 3U, UINT64_MAX));
 }
 
 TEST_F(TraceMergerTest, OrdersTheEventsOfAllProcessorsByTime)
@@ -134,7 +134,7 @@ TEST_F(TraceMergerTest, OrdersAnyEventsAsSortingWould)
             const std::uint32_t cpu = cpuByte % times.size();
             if (isReading) {
                 settled = std::max(settled, *std::ranges::min_element(times) - 1);
-                for (const KernelTraceEvent& event : tested.eventsUpTo(settled))
+                for (const TracedMarker& event : tested.eventsUpTo(settled))
                     merged.emplace_back(event.timestamp, event.cpu);
                 for (std::uint64_t& time : times)
                     time = std::max(time, settled + 1);
@@ -143,7 +143,7 @@ TEST_F(TraceMergerTest, OrdersAnyEventsAsSortingWould)
             tested.take(cpu, asBytes(TracePageBuilder(times[cpu]).event(times[cpu], ++code).page()));
             expected.emplace_back(times[cpu], cpu);
         }
-        for (const KernelTraceEvent& event : tested.eventsUpTo(UINT64_MAX))
+        for (const TracedMarker& event : tested.eventsUpTo(UINT64_MAX))
             merged.emplace_back(event.timestamp, event.cpu);
         std::ranges::stable_sort(expected);
         RC_ASSERT(merged == expected);

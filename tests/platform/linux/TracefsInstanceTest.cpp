@@ -174,6 +174,21 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenTheKernelsFormatsAreOthers)
     EXPECT_EQ(problem(), "");
 }
 
+TEST_F(TracefsInstanceTest, IsNotUsedWhenPagesWouldHoldNothingButTheirHead)
+{
+    const fs::path path = tree.instance / "events/header_page";
+    const std::string right = readFile(path);
+    const auto problemWithOffset = [&](const std::string& offset) {
+        std::string changed = right;
+        writeFile(path, changed.replace(right.find("offset:16;"), 10, "offset:" + offset + ";"));
+        return problem();
+    };
+    EXPECT_EQ(problemWithOffset("4095"), "");
+    for (const char* offset : {"4096", "5000", "9223372036854775807"})
+        EXPECT_THAT(problemWithOffset(offset), EndsWith("events/header_page is not as this service knows it"))
+            << offset;
+}
+
 TEST_F(TracefsInstanceTest, LooksOnlyAtProcessors)
 {
     for (const char* name : {"cpu", "cpux", "cpu-1", "cpu99999999999", "other"})

@@ -37,14 +37,25 @@ std::uint64_t now()
     return static_cast<std::uint64_t>(std::chrono::steady_clock::now().time_since_epoch().count());
 }
 
+// In microseconds.
+std::int64_t timeOfDay()
+{
+    return std::chrono::floor<std::chrono::microseconds>(std::chrono::system_clock::now()).time_since_epoch().count();
+}
+std::int64_t timeOfDay(const KernelTraceEvent& event)
+{
+    return event.wallTime.seconds * 1'000'000 + event.wallTime.microseconds;
+}
+constexpr std::int64_t clockTolerance = 500'000; // the two clocks are not looked at in one moment
+
 // A session and what was delivered to it.
 class Listener {
 public:
-    explicit Listener(TracefsKernelTrace& trace) : session(trace.createTraceSession())
+    explicit Listener(TracefsKernelTrace& trace, bool hasWallTimes = true) : session(trace.createTraceSession())
     {
         if (!session)
             throw std::runtime_error("there is no trace");
-        session->enableWallTimes(true);
+        session->enableWallTimes(hasWallTimes);
         session->setCompletionHandler([this] {
             const std::scoped_lock lock(mutex_);
             ++completions_;
@@ -95,7 +106,7 @@ public:
     {
         std::vector<std::uint32_t> codes;
         for (const KernelTraceEvent& event : events())
-            codes.push_back(event.code);
+            codes.push_back(event.eventCode);
         return codes;
     }
 
@@ -165,6 +176,7 @@ TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
 {
     Listener listener(trace);
     ASSERT_EQ(listener.start(), 0);
+    const std::int64_t day = timeOfDay();
     const std::uint64_t time = now();
     tree.put(0,
              TracePageBuilder(1000)
@@ -180,8 +192,18 @@ TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
     EXPECT_TRUE(listener.waitForCompletion());
     EXPECT_THAT(listener.codes(), ElementsAre(firstCode + 1, firstCode + 2, lastCode));
     const KernelTraceEvent first = listener.events()[0];
-    EXPECT_EQ(first.thread, 77U);
+    EXPECT_EQ(first.threadID, 77U);
     EXPECT_EQ(listener.session->timestampToNanoseconds(first.timestamp), time);
+    EXPECT_NEAR(timeOfDay(first), day, clockTolerance);
+}
+
+TEST_F(TracefsKernelTraceTest, TellsNoTimeOfDayToWhoDoesNotWantIt)
+{
+    Listener listener(trace, false);
+    ASSERT_EQ(listener.start(), 0);
+    tree.put(0, TracePageBuilder(1000).event(now(), firstCode).page());
+    ASSERT_TRUE(listener.waitForEvents(1));
+    EXPECT_EQ(listener.events()[0].wallTime, KernelTraceWallTime());
 }
 
 TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherSomebodyTraces)
@@ -343,6 +365,7 @@ TEST_F(RealTraceTest, DeliversTheEventsOfThisProcessWithTheirTimes)
     const TraceMarkerRecord early{.code = firstCode};
     EXPECT_LT(::write(marker, &early, sizeof early), 0) << "the kernel takes nothing while nobody traces";
     ASSERT_EQ(listener.start(), 0);
+    const std::int64_t day = timeOfDay();
     const std::uint64_t before = now();
     ownMarkers.emit(firstCode + 1, {1, 2, 3, UINT64_MAX});
     const std::uint64_t between = now();
@@ -354,9 +377,10 @@ TEST_F(RealTraceTest, DeliversTheEventsOfThisProcessWithTheirTimes)
     ASSERT_THAT(listener.codes(), ElementsAre(firstCode + 1, firstCode + 2));
     const auto events = listener.events();
     EXPECT_THAT(events[0].arguments, ElementsAre(1U, 2U, 3U, UINT64_MAX));
-    EXPECT_EQ(events[0].thread, static_cast<std::uint64_t>(::gettid()));
+    EXPECT_EQ(events[0].threadID, static_cast<std::uint64_t>(::gettid()));
     EXPECT_GE(events[0].timestamp, before);
     EXPECT_LE(events[0].timestamp, between);
+    EXPECT_NEAR(timeOfDay(events[0]), day, clockTolerance);
     EXPECT_GE(events[1].timestamp, between);
     EXPECT_LE(events[1].timestamp, after);
     EXPECT_THAT(log.lines(), IsEmpty());
@@ -429,9 +453,9 @@ TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
         EXPECT_TRUE(std::ranges::is_sorted(events, {}, &KernelTraceEvent::timestamp));
         std::array<std::vector<std::uint64_t>, processes> delivered;
         for (const KernelTraceEvent& event : events) {
-            ASSERT_LT(event.code - firstCode, processes);
-            ASSERT_EQ(event.thread, static_cast<std::uint64_t>(children[event.code - firstCode]));
-            delivered[event.code - firstCode].push_back(event.arguments[0]);
+            ASSERT_LT(event.eventCode - firstCode, processes);
+            ASSERT_EQ(event.threadID, static_cast<std::uint64_t>(children[event.eventCode - firstCode]));
+            delivered[event.eventCode - firstCode].push_back(event.arguments[0]);
         }
         for (std::size_t index = 0; index < processes; ++index) {
             const Emitter& emitter = emitters[index];
