@@ -68,6 +68,15 @@ public:
         return this->EndValue(true);
     }
 
+    // A member of an object by its text, the key and the value.
+    bool writeMember(std::string_view text)
+    {
+        prefix(rapidjson::kStringType);
+        ++this->level_stack_.template Top<typename RapidWriter::Level>()->valueCount; // which the text holds too
+        stream_.out.append(text);
+        return this->EndValue(true);
+    }
+
 private:
     void prefix(rapidjson::Type type)
     {

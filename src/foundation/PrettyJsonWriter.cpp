@@ -27,6 +27,16 @@ public:
             passOn();
     }
 
+    void writeMember(std::string_view key, CborItem value, std::string& text)
+    {
+        write([&](auto& writer) {
+            const std::size_t before = text_.size();
+            const bool isWritten = writer.writeText(key) && writer.write(value);
+            text.assign(text_, text_.find('"', before)); // behind the indent
+            return isWritten;
+        });
+    }
+
 private:
     void passOn()
     {
@@ -76,6 +86,16 @@ void PrettyJsonWriter::write(const Value& value)
 void PrettyJsonWriter::write(CborItem item)
 {
     implementation_->write([item](auto& writer) { return writer.write(item); });
+}
+
+void PrettyJsonWriter::writeMember(std::string_view key, CborItem value, std::string& text)
+{
+    implementation_->writeMember(key, value, text);
+}
+
+void PrettyJsonWriter::writeMember(std::string_view text)
+{
+    implementation_->write([text](auto& writer) { return writer.writeMember(text); });
 }
 
 bool PrettyJsonWriter::isWhole() const

@@ -26,6 +26,10 @@ public:
     void key(std::string_view key);
     void write(const Value& value);
     void write(CborItem item);
+    // A key and its value. Their text is put into `text`: it may be written instead, wherever as many objects and
+    // arrays are open.
+    void writeMember(std::string_view key, CborItem value, std::string& text);
+    void writeMember(std::string_view text);
 
     // False once a value held NaN or infinity, which JSON cannot say. What was written is then of no use, and nothing
     // more is written.

@@ -156,22 +156,43 @@ bool isSummaryFileName(std::string_view name)
         && name.ends_with(".json");
 }
 
+// What stands at a place of the payloads, as it was written last.
+struct WrittenEntry {
+    std::string_view key;
+    const char* place = nullptr; // of the value; null while no text is kept
+    std::string text = {};
+};
+
+void writeEntry(foundation::PrettyJsonWriter& writer, WrittenEntry& entry, foundation::CborItem value)
+{
+    constexpr std::size_t longestKept = 1024;
+    if (entry.place == value.bytes().data())
+        return writer.writeMember(entry.text);
+    writer.writeMember(entry.key, value, entry.text);
+    entry.place = value.bytes().data();
+    if (entry.text.size() > longestKept)
+        entry = {.key = entry.key};
+}
+
+void writeEntry(foundation::PrettyJsonWriter& writer, const WrittenEntry& entry, const foundation::Value& value)
+{
+    writer.key(entry.key);
+    writer.write(value);
+}
+
 // An array of one-entry objects, identifier to payload. False when the store holds what JSON cannot say.
 bool writeJson(const KestoReportingMessageStore& store, foundation::PrettyJsonWriter::Sink sink)
 {
     foundation::PrettyJsonWriter writer(std::move(sink));
-    KestoReportingEntryReader<std::string_view> entries;
+    KestoReportingEntryReader<WrittenEntry> entries;
     writer.beginArray();
     store.forEach([&](const KestoReportingMessageStore::Message& message) {
         writer.beginObject();
         writer.key(store.identifier(message));
         writer.beginObject();
         entries.read(
-            message.kind, message.payload, [](std::string_view key) { return key; },
-            [&](std::string_view key, const auto& value) {
-                writer.key(key);
-                writer.write(value);
-            });
+            message.kind, message.payload, [](std::string_view key) { return WrittenEntry{.key = key}; },
+            [&](WrittenEntry& entry, const auto& value) { writeEntry(writer, entry, value); });
         writer.endObject();
         writer.endObject();
     });

@@ -111,6 +111,26 @@ TEST(RapidMessages, CountAsTimeZeroWithoutATime)
         << "after a time long before zero that is a pause";
 }
 
+TEST(RapidMessages, JoinHoweverManyPayloadsStandBetweenThem)
+{
+    for (const int between : {1, 254, 255, 256, 257, 600}) {
+        Messages payloads;
+        Messages combined;
+        for (int burst = 0; burst < 3; ++burst) {
+            payloads.push_back(flip(10 * burst));
+            combined.push_back(flip(10 * burst + 1, false));
+            for (int number = 0; number < between; ++number) {
+                payloads.push_back(plain(number));
+                combined.push_back(plain(number));
+            }
+            payloads.push_back(flip(10 * burst + 1, false));
+            payloads.push_back(plain(-1));
+            combined.push_back(plain(-1));
+        }
+        EXPECT_EQ(combine(payloads), combined) << between;
+    }
+}
+
 TEST(RapidMessages, JoinWhenTimeFalls)
 {
     EXPECT_THAT(combine({flip(100), flip(1), flip(3)}), ElementsAre(flip(3)));

@@ -256,6 +256,23 @@ RC_GTEST_PROP(SummaryOfAnyStore, IsWhatItsDefinitionMakesOfIt, ())
     }
 }
 
+// More kinds of messages, and more entries in each, than are remembered from one message to the next.
+TEST_F(Summary, IsMadeOfManyKindsOfLongMessages)
+{
+    constexpr int kinds = 20;
+    for (int number = 0; number < 5 * kinds; ++number) {
+        Dictionary::Entries entries{{"number", number}};
+        for (int key = number % 3; key < 100; ++key)
+            entries.push_back({foundation::String("key " + std::to_string(key)), key % 7 == 0 ? number / 50 : key});
+        session->sendMessage(Dictionary(std::move(entries)), static_cast<AudioEventCategory>(1 + number % kinds / 2),
+                             static_cast<AudioEventType>(1 + number % 2), nullptr);
+    }
+    const Messages messages = *session->nestedAggregatedPayloadData();
+    ASSERT_THAT(messages, SizeIs(5 * kinds));
+    EXPECT_EQ(Value(*session->createSummaryEventForSession()).text(),
+              Value(*naive::createSummaryEvent(messages, 8)).text());
+}
+
 // --- a summary that is too large to be encoded
 
 class LargeSummary : public Summary {
