@@ -234,7 +234,8 @@ void addClientCommand(CLI::App& application, int& exitStatus)
   ["create", 42]
   ["setServiceType", "longformaudio", 42]
   ["setConfiguration", {"HostApplicationDisplayID": "org.example.player"}, 42]
-  ["start", 42]                    answered when the session is stopped
+  ["start", 42]                    answered when the session is stopped; where kernel traces are on,
+                                   that of a session of the type "test" is answered at once, too
   ["send", {"volume": 0.5}, "Playback", "Start", [42]]     null in place of the list: all started sessions
   ["getServiceName", 42]  ["validate", 42]  ["getAllReporters"]
   ["stop", 42]  ["destroy", 42]  ["kill"]

@@ -1,11 +1,11 @@
 // `kesto summary`: the file that a session leaves on internal builds, as a timeline that a person can read.
 #include "Commands.h"
+#include "InputFile.h"
 #include "JsonReader.h"
 #include "Terminal.h"
 #include "Timeline.h"
 #include "foundation/LocalTime.h"
 
-#include <cerrno>
 #include <cmath>
 #include <cstdio>
 #include <filesystem>
@@ -13,8 +13,6 @@
 #include <memory>
 #include <stdexcept>
 #include <string>
-#include <sys/stat.h>
-#include <system_error>
 #include <vector>
 
 namespace {
@@ -25,24 +23,6 @@ using foundation::Value;
 constexpr std::size_t timeColumns = 12;
 constexpr std::size_t markColumns = 2;
 constexpr std::size_t kindColumns = 26;
-
-struct CloseFile {
-    void operator()(std::FILE* file) const { std::fclose(file); }
-};
-using File = std::unique_ptr<std::FILE, CloseFile>;
-
-File open(const std::filesystem::path& path)
-{
-    File file(std::fopen(path.c_str(), "re"));
-    struct stat status{};
-    int error = file && ::fstat(::fileno(file.get()), &status) == 0 ? 0 : errno;
-    if (error == 0 && S_ISDIR(status.st_mode))
-        error = EISDIR;
-    if (error != 0)
-        throw std::runtime_error(
-            fmt::format("cannot read {}: {}", path.native(), std::generic_category().message(error)));
-    return file;
-}
 
 // "0:02.105", or "1:00:02.105" from an hour on.
 std::string clockText(double seconds)
@@ -75,7 +55,7 @@ public:
     // Reads and shows the file.
     void show(const std::filesystem::path& path)
     {
-        const File file = open(path);
+        const InputFile file = openInput(path);
         std::string problem;
         const auto read = forEachJsonElement(file.get(), [&](const Value& element) {
             const bool isMessage = showMessage(path, element);

@@ -3,9 +3,9 @@
 #include "TraceRecording.h"
 
 #include "Commands.h"
+#include "InputFile.h"
 #include "Places.h"
 #include "Terminal.h"
-#include "TraceInput.h"
 #include "TraceView.h"
 #include "foundation/PropertyList.h"
 #include "platform/linux/FileDescriptor.h"
@@ -48,7 +48,7 @@ std::string errorText(int error)
 // The service goes on with whatever it finds; an engineer wants to know before.
 void checkParameters(const fs::path& path)
 {
-    const std::string text = readTraceInput(path, foundation::PropertyListLimits().bytes);
+    const std::string text = readInput(path, foundation::PropertyListLimits().bytes);
     if (const auto list = foundation::readPropertyList(text); !list)
         fail("{} is no parameters file: {}", printable(path.native()), printable(list.error().text));
 }

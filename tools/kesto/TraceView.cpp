@@ -1,8 +1,8 @@
 // Times are shown in the unit that suits them, with four digits: enough to compare, few enough to read.
 #include "TraceView.h"
 
+#include "InputFile.h"
 #include "Terminal.h"
-#include "TraceInput.h"
 #include "TraceResultsFile.h"
 #include "TraceStatistics.h"
 #include "foundation/Json.h"
@@ -24,7 +24,7 @@ using foundation::Value;
 TraceResultsFile read(const std::filesystem::path& path)
 {
     constexpr std::size_t largest = std::size_t{512} << 20; // twice what the service writes
-    auto results = parseTraceResults(readTraceInput(path, largest));
+    auto results = parseTraceResults(readInput(path, largest));
     if (!results)
         throw std::runtime_error(
             fmt::format("{} is no results file of a trace: {}", printable(path.native()), results.error()));

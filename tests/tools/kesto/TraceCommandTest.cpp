@@ -117,17 +117,22 @@ TEST_F(TraceCommand, FailsOnWhatIsNoResultsFile)
         const Finished finished = tool.run({"trace", file});
         EXPECT_EQ(finished.status, 1);
         EXPECT_EQ(finished.output, "");
-        EXPECT_EQ(finished.errors, "kesto: " + file + reason + "\n");
+        EXPECT_EQ(finished.errors, "kesto: " + reason + "\n");
     };
-    const std::string missing = directory.path() / "missing";
-    expectFailure(missing, " cannot be read: No such file or directory");
-    expectFailure(directory.path(), " cannot be read: it is not a regular file");
+    const auto expectUnread = [&](const std::string& file, const std::string& reason) {
+        expectFailure(file, "cannot read " + file + ": " + reason);
+    };
+    expectUnread(directory.path() / "missing", "No such file or directory");
+    expectUnread(directory.path(), "it is not a regular file");
     const std::string pipe = directory.path() / "pipe";
     ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
-    expectFailure(pipe, " cannot be read: it is not a regular file");
-    expectFailure(write("[]"), " is no results file of a trace: it is not an object");
-    expectFailure(writeRecords("1"), " is no results file of a trace: its record 1 is not a name, a value and a unit");
-    expectFailure(write(R"({"records":[)"), " is no results file of a trace: not JSON: Invalid value. (at byte 13)");
+    expectUnread(pipe, "it is not a regular file");
+    const auto expectNoResults = [&](const std::string& file, const std::string& reason) {
+        expectFailure(file, file + " is no results file of a trace: " + reason);
+    };
+    expectNoResults(write("[]"), "it is not an object");
+    expectNoResults(writeRecords("1"), "its record 1 is not a name, a value and a unit");
+    expectNoResults(write(R"({"records":[)"), "not JSON: Invalid value. (at byte 13)");
 }
 
 } // namespace

@@ -109,7 +109,7 @@ TEST_F(TraceRecord, DoesNotRunTheProgramWithoutParameters)
     support::writeFile(path("steps.plist"), "<plist><dict>\n<key>");
     expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist is no parameters file: line 2");
     std::filesystem::remove(path("steps.plist"));
-    expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist cannot be read: No such file or directory");
+    expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist: No such file or directory");
 }
 
 TEST_F(TraceRecord, IsRefusedWithAWrongCommandLine)
