@@ -248,8 +248,8 @@ try {
     auto paths = libkesto::servicePaths(textOrEmpty(options.socket_path), textOrEmpty(options.service_name));
     if (!paths)
         return paths.error();
-    std::unique_ptr<libkesto::Tracer> tracer;
-    if (options.trace && (tracer = libkesto::Tracer::create()) == nullptr)
+    auto tracer = options.trace ? libkesto::Tracer::create() : nullptr;
+    if (options.trace && tracer == nullptr)
         return KESTO_SYSTEM_ERROR;
     auto made = kesto_client::create(settings(options, *std::move(paths), std::move(listener), std::move(tracer)));
     if (made == nullptr)

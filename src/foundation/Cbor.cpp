@@ -72,12 +72,10 @@ void appendHead(Major major, std::uint64_t argument, std::string& out)
     append(longestHead, out, [&](char* place) { return putHead(major, argument, place); });
 }
 
-void appendBytes(Major major, std::string_view bytes, std::string& out)
+char* putBytes(Major major, std::string_view bytes, char* place) noexcept
 {
-    append(longestHead + bytes.size(), out, [&](char* place) {
-        char* const begin = putHead(major, bytes.size(), place);
-        return begin + bytes.copy(begin, bytes.size());
-    });
+    place = putHead(major, bytes.size(), place);
+    return place + bytes.copy(place, bytes.size());
 }
 
 char* putSimple(Head::Simple simple, char* place) noexcept
@@ -138,7 +136,7 @@ void appendCborInteger(std::uint64_t value, std::string& out)
 
 void appendCborText(std::string_view text, std::string& out)
 {
-    appendBytes(Major::Text, text, out);
+    append(longestHead + text.size(), out, [&](char* place) { return putBytes(Major::Text, text, place); });
 }
 
 void appendCborArrayHead(std::uint64_t count, std::string& out)
@@ -151,13 +149,76 @@ void appendCborMapHead(std::uint64_t count, std::string& out)
     appendHead(Major::Map, count, out);
 }
 
+namespace {
+
+std::size_t mostBytes(const Dictionary& dictionary) noexcept;
+
+// What the encoding takes at most: as if every head were the longest.
+std::size_t mostBytes(const Value& value) noexcept
+{
+    switch (value.kind()) {
+    case Value::Kind::String: return longestHead + value.stringView().size();
+    case Value::Kind::Dictionary: return mostBytes(*value.dictionary());
+    case Value::Kind::Array: {
+        std::size_t bytes = longestHead;
+        const Array array = *value.array();
+        for (const Value& element : array)
+            bytes += mostBytes(element);
+        return bytes;
+    }
+    case Value::Kind::Data: return longestHead + value.data()->bytes.view().size();
+    case Value::Kind::Date: return 2 * longestHead;
+    default: return longestHead;
+    }
+}
+
+std::size_t mostBytes(const Dictionary& dictionary) noexcept
+{
+    std::size_t bytes = longestHead;
+    for (const auto& [key, value] : dictionary)
+        bytes += longestHead + key.view().size() + mostBytes(value);
+    return bytes;
+}
+
+char* put(const Dictionary& dictionary, char* place) noexcept;
+
+char* put(const Value& value, char* place) noexcept
+{
+    switch (value.kind()) {
+    case Value::Kind::Null: return putSimple(Null, place);
+    case Value::Kind::Number: return putNumber(*value.number(), place);
+    case Value::Kind::String: return putBytes(Major::Text, value.stringView(), place);
+    case Value::Kind::Dictionary: return put(*value.dictionary(), place);
+    case Value::Kind::Data: return putBytes(Major::Bytes, value.data()->bytes, place);
+    case Value::Kind::Date:
+        return putNumber(Number(value.date()->secondsSince1970), putHead(Major::Tag, epochDateTag, place));
+    case Value::Kind::Array: break;
+    }
+    const Array array = *value.array();
+    place = putHead(Major::Array, array.size(), place);
+    for (const Value& element : array)
+        place = put(element, place);
+    return place;
+}
+
+char* put(const Dictionary& dictionary, char* place) noexcept
+{
+    place = putHead(Major::Map, dictionary.size(), place);
+    for (const auto& [key, value] : dictionary)
+        place = put(value, putBytes(Major::Text, key, place));
+    return place;
+}
+
+} // namespace
+
 void appendCbor(const Dictionary& dictionary, std::string& out)
 {
-    appendCborMapHead(dictionary.size(), out);
-    for (const auto& [key, value] : dictionary) {
-        appendCborText(key, out);
-        appendCbor(value, out);
-    }
+    append(mostBytes(dictionary), out, [&](char* place) { return put(dictionary, place); });
+}
+
+void appendCbor(const Value& value, std::string& out)
+{
+    append(mostBytes(value), out, [&](char* place) { return put(value, place); });
 }
 
 std::size_t cborSize(const Dictionary& dictionary)
@@ -165,28 +226,6 @@ std::size_t cborSize(const Dictionary& dictionary)
     std::string encoded;
     appendCbor(dictionary, encoded);
     return encoded.size();
-}
-
-void appendCbor(const Value& value, std::string& out)
-{
-    switch (value.kind()) {
-    case Value::Kind::Null: return appendCborNull(out);
-    case Value::Kind::Number:
-        return append(longestHead, out, [&](char* place) { return putNumber(*value.number(), place); });
-    case Value::Kind::String: return appendCborText(value.stringView(), out);
-    case Value::Kind::Dictionary: return appendCbor(*value.dictionary(), out);
-    case Value::Kind::Array: {
-        const Array array = *value.array();
-        appendCborArrayHead(array.size(), out);
-        for (const Value& element : array)
-            appendCbor(element, out);
-        return;
-    }
-    case Value::Kind::Data: return appendBytes(Major::Bytes, value.data()->bytes, out);
-    case Value::Kind::Date:
-        appendHead(Major::Tag, epochDateTag, out);
-        return appendCbor(Value(value.date()->secondsSince1970), out);
-    }
 }
 
 // Reads one item after the other. The first error empties the rest, so that every loop ends by itself, and
@@ -357,14 +396,13 @@ private:
             return {};
         }
         const std::string_view key = readBytes(head);
-        String* const place = decoder_.placeOf(key);
-        if (place != nullptr && *place == key)
-            return *place;
+        if (const String* const known = decoder_.find(key))
+            return *known;
         if (!isText(head, key)) {
             fail(CborError::InvalidUtf8);
             return {};
         }
-        return place == nullptr ? String(key) : *place = String(key);
+        return decoder_.remember(key);
     }
 
     // Room for what a container claims to hold, as long as the claim is modest: it is not to be trusted.
@@ -440,13 +478,24 @@ std::uint64_t hashOf(std::string_view key) noexcept
 
 } // namespace
 
-String* CborDecoder::placeOf(std::string_view key)
+// Messages repeat not only their keys but also their order: the one that followed the last one is looked at first.
+const String* CborDecoder::find(std::string_view key)
 {
-    if (key.empty() || key.size() > longestRememberedKey)
+    if (key.size() > longestRememberedKey)
         return nullptr;
     if (keys_.empty())
         keys_.resize(rememberedKeys);
-    return &keys_[hashOf(key) % rememberedKeys];
+    std::uint8_t& follower = followers_[last_];
+    last_ = follower;
+    if (keys_[last_] == key)
+        return &keys_[last_];
+    last_ = follower = static_cast<std::uint8_t>(hashOf(key) % rememberedKeys);
+    return keys_[last_] == key ? &keys_[last_] : nullptr;
+}
+
+String CborDecoder::remember(std::string_view key)
+{
+    return key.size() > longestRememberedKey ? String(key) : keys_[last_] = String(key);
 }
 
 } // namespace foundation

@@ -11,7 +11,9 @@
 
 #include "foundation/Value.h"
 
+#include <array>
 #include <cstddef>
+#include <cstdint>
 #include <expected>
 #include <string>
 #include <string_view>
@@ -63,12 +65,16 @@ public:
 
 private:
     friend class CborReader;
-    // Where the key is remembered, or is to be; null for keys that are not.
-    [[nodiscard]] String* placeOf(std::string_view key);
+    // The remembered string with these characters, or null.
+    [[nodiscard]] const String* find(std::string_view key);
+    // A new string, remembered for the next time where `find` has just looked for it.
+    [[nodiscard]] String remember(std::string_view key);
 
     static constexpr std::size_t longestRememberedKey = 64;
     static constexpr std::size_t rememberedKeys = 256;
     std::vector<String> keys_; // from the first key on, by a hash of their characters; a newcomer takes the place
+    std::array<std::uint8_t, rememberedKeys> followers_{}; // by place, that of the key which came next
+    std::uint8_t last_ = 0; // place
 };
 
 } // namespace foundation

@@ -25,11 +25,6 @@ bool equalsInteger(double value, std::uint64_t integer) noexcept
 
 } // namespace
 
-bool Number::booleanValue() const noexcept
-{
-    return isFloat() ? doubleValue() != 0 : bits_ != 0;
-}
-
 std::int64_t Number::int64Value() const noexcept
 {
     constexpr auto least = std::numeric_limits<std::int64_t>::min();
@@ -44,16 +39,6 @@ std::int64_t Number::int64Value() const noexcept
     if (value >= twoTo63)
         return most;
     return value < -twoTo63 ? least : static_cast<std::int64_t>(value);
-}
-
-double Number::doubleValue() const noexcept
-{
-    switch (kind_) {
-    case Kind::Float32: return std::bit_cast<float>(static_cast<std::uint32_t>(bits_));
-    case Kind::Float64: return std::bit_cast<double>(bits_);
-    case Kind::Unsigned64: return static_cast<double>(bits_);
-    default: return static_cast<double>(signedBits());
-    }
 }
 
 std::string Number::text() const

@@ -67,6 +67,21 @@ private:
     std::uint64_t bits_; // of the integer in two's complement, or of the float of either width
 };
 
+inline bool Number::booleanValue() const noexcept
+{
+    return isFloat() ? doubleValue() != 0 : bits_ != 0;
+}
+
+inline double Number::doubleValue() const noexcept
+{
+    switch (kind_) {
+    case Kind::Float32: return std::bit_cast<float>(static_cast<std::uint32_t>(bits_));
+    case Kind::Float64: return std::bit_cast<double>(bits_);
+    case Kind::Unsigned64: return static_cast<double>(bits_);
+    default: return static_cast<double>(signedBits());
+    }
+}
+
 template <std::integral Integer> std::optional<Integer> Number::exactly() const noexcept
 {
     const auto inRange = [](auto value) -> std::optional<Integer> {

@@ -18,30 +18,6 @@ namespace foundation {
 
 // --- Value
 
-Value::Value(String text) noexcept : kind_(Kind::String), object_(text.object_.leak()) { }
-Value::Value(Array array) noexcept : kind_(Kind::Array), object_(array.object_.leak()) { }
-Value::Value(Dictionary dictionary) noexcept : kind_(Kind::Dictionary), object_(dictionary.object_.leak()) { }
-Value::Value(Data data) noexcept : kind_(Kind::Data), object_(data.bytes.object_.leak()) { }
-Value::Value(Date date) noexcept : kind_(Kind::Date), date_(date.secondsSince1970) { }
-
-template <typename Object> const Object* Value::objectAs() const noexcept
-{
-    return static_cast<const Object*>(object_);
-}
-
-template <typename Object> Reference<Object> Value::shareAs() const noexcept
-{
-    if (object_ == nullptr)
-        return {};
-    object_->retain();
-    return Reference<Object>::adopt(objectAs<Object>());
-}
-
-std::string_view Value::bytesUnchecked() const noexcept
-{
-    return object_ == nullptr ? std::string_view() : objectAs<StringObject>()->view();
-}
-
 void Value::destroyObject() noexcept
 {
     switch (kind_) {
@@ -49,48 +25,6 @@ void Value::destroyObject() noexcept
     case Kind::Dictionary: return DictionaryObject::destroy(objectAs<DictionaryObject>());
     default: return StringObject::destroy(objectAs<StringObject>());
     }
-}
-
-std::optional<Number> Value::number() const noexcept
-{
-    if (kind_ != Kind::Number)
-        return std::nullopt;
-    return numberUnchecked();
-}
-
-std::optional<String> Value::string() const noexcept
-{
-    if (kind_ != Kind::String)
-        return std::nullopt;
-    return String(shareAs<StringObject>());
-}
-
-std::optional<Array> Value::array() const noexcept
-{
-    if (kind_ != Kind::Array)
-        return std::nullopt;
-    return Array(shareAs<ArrayObject>());
-}
-
-std::optional<Dictionary> Value::dictionary() const noexcept
-{
-    if (kind_ != Kind::Dictionary)
-        return std::nullopt;
-    return Dictionary(shareAs<DictionaryObject>());
-}
-
-std::optional<Data> Value::data() const noexcept
-{
-    if (kind_ != Kind::Data)
-        return std::nullopt;
-    return Data{String(shareAs<StringObject>())};
-}
-
-std::optional<Date> Value::date() const noexcept
-{
-    if (kind_ != Kind::Date)
-        return std::nullopt;
-    return Date{date_};
 }
 
 namespace {

@@ -255,4 +255,60 @@ private:
     Reference<DictionaryObject> object_;
 };
 
+// --- What is as short as that is to cost no call.
+
+inline Value::Value(String text) noexcept : kind_(Kind::String), object_(text.object_.leak()) { }
+inline Value::Value(Array array) noexcept : kind_(Kind::Array), object_(array.object_.leak()) { }
+inline Value::Value(Dictionary dictionary) noexcept : kind_(Kind::Dictionary), object_(dictionary.object_.leak()) { }
+inline Value::Value(Data data) noexcept : kind_(Kind::Data), object_(data.bytes.object_.leak()) { }
+inline Value::Value(Date date) noexcept : kind_(Kind::Date), date_(date.secondsSince1970) { }
+
+template <typename Object> const Object* Value::objectAs() const noexcept
+{
+    return static_cast<const Object*>(object_);
+}
+
+template <typename Object> Reference<Object> Value::shareAs() const noexcept
+{
+    if (object_ == nullptr)
+        return {};
+    object_->retain();
+    return Reference<Object>::adopt(objectAs<Object>());
+}
+
+inline std::string_view Value::bytesUnchecked() const noexcept
+{
+    return object_ == nullptr ? std::string_view() : objectAs<StringObject>()->view();
+}
+
+inline std::optional<Number> Value::number() const noexcept
+{
+    return kind_ == Kind::Number ? std::optional(numberUnchecked()) : std::nullopt;
+}
+
+inline std::optional<String> Value::string() const noexcept
+{
+    return kind_ == Kind::String ? std::optional(String(shareAs<StringObject>())) : std::nullopt;
+}
+
+inline std::optional<Array> Value::array() const noexcept
+{
+    return kind_ == Kind::Array ? std::optional(Array(shareAs<ArrayObject>())) : std::nullopt;
+}
+
+inline std::optional<Dictionary> Value::dictionary() const noexcept
+{
+    return kind_ == Kind::Dictionary ? std::optional(Dictionary(shareAs<DictionaryObject>())) : std::nullopt;
+}
+
+inline std::optional<Data> Value::data() const noexcept
+{
+    return kind_ == Kind::Data ? std::optional(Data{String(shareAs<StringObject>())}) : std::nullopt;
+}
+
+inline std::optional<Date> Value::date() const noexcept
+{
+    return kind_ == Kind::Date ? std::optional(Date{date_}) : std::nullopt;
+}
+
 } // namespace foundation

@@ -91,12 +91,22 @@ foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Diction
 
 namespace {
 
+// A thread says the same tag many times in a row.
 foundation::DictionaryEntry audioMessageTag(AudioEventCategory category, AudioEventType type)
 {
+    struct Tag {
+        AudioEventCategory category;
+        AudioEventType type;
+        foundation::String text;
+    };
     static const foundation::String tagKey("audiotag");
-    std::string tag = KestoReportingUtilityCategoryString(category);
-    tag += KestoReportingUtilityTypeString(type);
-    return {tagKey, tag};
+    thread_local std::optional<Tag> last;
+    if (!last || last->category != category || last->type != type) {
+        std::string text = KestoReportingUtilityCategoryString(category);
+        text += KestoReportingUtilityTypeString(type);
+        last = Tag{category, type, foundation::String(text)};
+    }
+    return {tagKey, last->text};
 }
 
 bool hasBlank(const foundation::String& key)

@@ -34,6 +34,12 @@ protected:
             thread.join();
     }
 
+    static void enterManyTimes(kesto_channel& channel, int thread)
+    {
+        for (std::size_t count = 0; count < 5'000; ++count)
+            channel.enter((count + static_cast<std::size_t>(thread)) % 4, libkesto::ChannelClock::now());
+    }
+
     // Since the last time.
     std::uint64_t rings()
     {
@@ -147,28 +153,10 @@ TEST_F(Channels, ATimeThatIsShownNeverBecomesLess)
     EXPECT_EQ(textOf(channel, milliseconds(50)), "state\nIdle 1 50 0.833333\nRunning 1 10 0.166667\n");
 }
 
-TEST_F(Channels, StatesLoseNoTransitionWhenManyEnterAtOnce)
+TEST_F(Channels, StatesLoseNoTimeWhenManyEnterAtOnce)
 {
     StateChannel channel(bell, {"0", "1", "2", "3"}, 0, begin);
-    std::atomic<bool> isDone = false;
-    std::string last;
-    std::thread reader([&] {
-        platform::StateResidency before;
-        while (!isDone) {
-            std::string text;
-            channel.appendText(text, libkesto::ChannelClock::now());
-            const platform::StateResidency first = platform::parseChannelFile(text)->states[0];
-            EXPECT_GE(first.residency, before.residency);
-            EXPECT_GE(first.transitions, before.transitions);
-            before = first;
-        }
-    });
-    inThreads([&](int thread) {
-        for (std::size_t count = 0; count < 5'000; ++count)
-            channel.enter((count + static_cast<std::size_t>(thread)) % 4, libkesto::ChannelClock::now());
-    });
-    isDone = true;
-    reader.join();
+    inThreads([&](int thread) { enterManyTimes(channel, thread); });
     const auto now = std::chrono::ceil<milliseconds>(libkesto::ChannelClock::now() - begin);
     const auto after = platform::parseChannelFile(textOf(channel, now));
     std::uint64_t total = 0;
@@ -176,6 +164,30 @@ TEST_F(Channels, StatesLoseNoTransitionWhenManyEnterAtOnce)
         total += state.residency;
     EXPECT_LE(total, static_cast<std::uint64_t>(now.count())) << "no time counts twice";
     EXPECT_GE(total + after->states.size(), static_cast<std::uint64_t>(now.count())) << "and none is lost";
+}
+
+// What is shown may run ahead of a thread that looked at the clock and enters its state late, so no sum is looked at
+// here.
+TEST_F(Channels, StatesNeverGoBackWhileManyEnterAtOnce)
+{
+    StateChannel channel(bell, {"0", "1", "2", "3"}, 0, begin);
+    std::atomic<bool> isDone = false;
+    std::thread reader([&] {
+        std::vector<platform::StateResidency> before(4);
+        while (!isDone) {
+            std::string text;
+            channel.appendText(text, libkesto::ChannelClock::now());
+            const auto states = platform::parseChannelFile(text)->states;
+            for (std::size_t place = 0; place < before.size(); ++place) {
+                EXPECT_GE(states[place].residency, before[place].residency);
+                EXPECT_GE(states[place].transitions, before[place].transitions);
+            }
+            before = states;
+        }
+    });
+    inThreads([&](int thread) { enterManyTimes(channel, thread); });
+    isDone = true;
+    reader.join();
 }
 
 // --- all

@@ -65,7 +65,7 @@ std::string histogramText(const ReportingChannel& channel)
     if (text.empty())
         return "none";
     text.pop_back();
-    return withUnit(std::move(text), channel) + fmt::format(", {} to {}", channel.minimum, channel.maximum);
+    return withUnit(text, channel) + fmt::format(", {} to {}", channel.minimum, channel.maximum);
 }
 
 // "Running 88.0% 12x, Idle 12.0% 11x": the share of time, and how often it was entered.
