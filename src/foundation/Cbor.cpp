@@ -481,7 +481,7 @@ std::uint64_t hashOf(std::string_view key) noexcept
 // Messages repeat not only their keys but also their order: the one that followed the last one is looked at first.
 const String* CborDecoder::find(std::string_view key)
 {
-    if (key.size() > longestRememberedKey)
+    if (!isRemembered(key))
         return nullptr;
     if (keys_.empty())
         keys_.resize(rememberedKeys);
@@ -495,7 +495,7 @@ const String* CborDecoder::find(std::string_view key)
 
 String CborDecoder::remember(std::string_view key)
 {
-    return key.size() > longestRememberedKey ? String(key) : keys_[last_] = String(key);
+    return isRemembered(key) ? keys_[last_] = String(key) : String(key);
 }
 
 } // namespace foundation

@@ -70,6 +70,11 @@ private:
     // A new string, remembered for the next time where `find` has just looked for it.
     [[nodiscard]] String remember(std::string_view key);
 
+    [[nodiscard]] static bool isRemembered(std::string_view key) noexcept
+    {
+        return !key.empty() && key.size() <= longestRememberedKey;
+    }
+
     static constexpr std::size_t longestRememberedKey = 64;
     static constexpr std::size_t rememberedKeys = 256;
     std::vector<String> keys_; // from the first key on, by a hash of their characters; a newcomer takes the place

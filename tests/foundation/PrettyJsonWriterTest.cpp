@@ -154,6 +154,38 @@ TEST(PrettyJsonWriter, IndentsOneMemberALine)
 ])");
 }
 
+RC_GTEST_PROP(PrettyJsonWriter, WritesAMemberAgainByItsText, ())
+{
+    const std::string key = *generated::text();
+    const std::string bytes = encoded(*generated::value());
+    const auto write = [](auto writeMember) {
+        Pieces pieces;
+        {
+            PrettyJsonWriter writer(pieces.sink());
+            writer.beginArray();
+            for (int object = 0; object < 2; ++object) {
+                writer.beginObject();
+                for (int member = 0; member < 3; ++member)
+                    writeMember(writer, member);
+                writer.endObject();
+            }
+            writer.endArray();
+        }
+        return pieces.text();
+    };
+    std::string text;
+    const std::string again = write([&](PrettyJsonWriter& writer, int member) {
+        if (member == 1 || text.empty())
+            writer.writeMember(key, CborItem(bytes), text);
+        else
+            writer.writeMember(text);
+    });
+    RC_ASSERT(again == write([&](PrettyJsonWriter& writer, int) {
+                  writer.key(key);
+                  writer.write(CborItem(bytes));
+              }));
+}
+
 TEST(PrettyJsonWriter, HandsLongTextOnInPieces)
 {
     Pieces pieces;

@@ -28,6 +28,22 @@ RC_GTEST_PROP(StringBuilder, JoinsWhatIsAppended, (const std::vector<std::string
     RC_ASSERT(foundation::Value(built) == foundation::Value(expected));
 }
 
+RC_GTEST_PROP(StringBuilder, RepeatsWhatStandsLast, (const std::string& before, const std::string& last))
+{
+    for (const std::size_t times : {0, 1, 2, 3, 100, 10'000}) {
+        StringBuilder builder;
+        builder.append(before);
+        builder.append(last);
+        builder.repeatLast(last.size(), times);
+        builder.append("!?");
+        builder.dropLast();
+        std::string expected = before;
+        for (std::size_t time = 0; time <= times; ++time)
+            expected += last;
+        RC_ASSERT(std::move(builder).finish().view() == expected + '!');
+    }
+}
+
 TEST(StringBuilder, GivesTheEmptyStringWhenNothingWasAppended)
 {
     EXPECT_TRUE(StringBuilder().finish().isSameObject(String()));
