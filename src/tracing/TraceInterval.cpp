@@ -66,10 +66,12 @@ private:
     std::size_t taken_ = 0;
 };
 
-inline void prefetchBehind(const trace_point& event)
+// Asks for the event whose turn is soon.
+inline void prefetchBehind(const trace_point& event, std::span<const trace_point> events)
 {
-    constexpr std::uintptr_t ahead = 24 * sizeof(trace_point);
-    __builtin_prefetch(reinterpret_cast<const void*>(reinterpret_cast<std::uintptr_t>(&event) + ahead));
+    constexpr std::ptrdiff_t ahead = 24;
+    if (events.data() + events.size() - &event > ahead)
+        __builtin_prefetch(&event + ahead);
 }
 
 } // namespace
@@ -91,7 +93,7 @@ void TraceInterval::processTracepointsSingleThread(const platform::KernelTraceSe
     std::uint32_t startDiscards = 0;
     std::uint32_t stopDiscards = 0;
     for (const trace_point& event : events) {
-        prefetchBehind(event);
+        prefetchBehind(event, events);
         if (event.eventCode == beginCode_) {
             auto& start = starts.take(event.threadID);
             startDiscards += start.isPending ? 1 : 0;
@@ -119,7 +121,7 @@ void TraceInterval::processTracepointsAnyThread(const platform::KernelTraceSessi
     std::uint32_t startDiscards = 0;
     std::uint32_t stopDiscards = 0;
     for (const trace_point& event : events) {
-        prefetchBehind(event);
+        prefetchBehind(event, events);
         if (event.eventCode == beginCode_) {
             startDiscards += start != 0 ? 1 : 0;
             start = event.timestamp;
