@@ -69,11 +69,12 @@ bool Tracer::attach(TraceDescriptors descriptors) noexcept
         && ::mmap(page_, TraceMarkerPage::size, PROT_READ, MAP_SHARED | MAP_FIXED, page.get(), 0) != MAP_FAILED;
 }
 
-// Neither can fail for what is there already: no new descriptor, no new range of addresses.
+// The marker first, too: who sees that nobody traces writes to nobody. Neither can fail for what is there already: no
+// new descriptor, no new range of addresses.
 void Tracer::detach() noexcept
 {
-    static_cast<void>(mapEmptyPage(MAP_FIXED));
     static_cast<void>(::dup3(nowhere_.get(), marker_.get(), O_CLOEXEC));
+    static_cast<void>(mapEmptyPage(MAP_FIXED));
 }
 
 } // namespace libkesto

@@ -8,8 +8,8 @@
 namespace foundation {
 namespace {
 
-constexpr std::uint32_t highestField = (1U << 29) - 1;
-constexpr std::size_t longestText = (std::size_t{1} << 31) - 1;
+[[maybe_unused]] constexpr std::uint32_t highestField = (1U << 29) - 1;
+[[maybe_unused]] constexpr std::size_t longestText = (std::size_t{1} << 31) - 1;
 
 char* putVarint(std::uint64_t value, char* place) noexcept
 {

@@ -3,6 +3,7 @@
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"
+#include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
 
 #include <array>
@@ -288,14 +289,6 @@ TEST_F(SendTest, AllocatesNothing)
 }
 
 // ---- No system call ----
-
-#if defined(__SANITIZE_THREAD__)
-constexpr bool threadSanitizerWatches = true;
-#elif defined(__has_feature)
-constexpr bool threadSanitizerWatches = __has_feature(thread_sanitizer);
-#else
-constexpr bool threadSanitizerWatches = false;
-#endif
 
 // From here on every system call of this thread but the end of the process kills it.
 void forbidSystemCalls()

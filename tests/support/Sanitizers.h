@@ -10,3 +10,15 @@
 #else
 #define KESTO_SKIP_WHERE_TYPES_ARE_CHECKED() static_cast<void>(0)
 #endif
+
+// The thread sanitizer makes system calls of its own, and has a thread that does not rest.
+#if defined(__SANITIZE_THREAD__)
+constexpr bool threadSanitizerWatches = true;
+#elif defined(__has_feature)
+constexpr bool threadSanitizerWatches = __has_feature(thread_sanitizer);
+#else
+constexpr bool threadSanitizerWatches = false;
+#endif
+#define KESTO_SKIP_WHERE_THREADS_ARE_WATCHED() \
+    if (threadSanitizerWatches)                \
+    GTEST_SKIP() << "the thread sanitizer has a thread of its own, that does not rest"

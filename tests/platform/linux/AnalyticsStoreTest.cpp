@@ -6,6 +6,7 @@
 #include "platform/linux/ManualClock.h"
 #include "platform/linux/StoreReader.h"
 #include "support/FakeLog.h"
+#include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
 
 #include <atomic>
@@ -472,6 +473,7 @@ TEST_F(AnalyticsStoreTest, NewBoundsAreAppliedWithoutAnotherEvent)
 
 TEST_F(AnalyticsStoreTest, AnIdleStoreDoesNotWake)
 {
+    KESTO_SKIP_WHERE_THREADS_ARE_WATCHED();
     send(1);
     store().flush();
     // Of all threads of this process but this one, since the switch of a thread is counted when it wakes.

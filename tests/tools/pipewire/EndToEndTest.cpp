@@ -1,6 +1,7 @@
 // The whole road: a sound that is really played on a real PipeWire, the program as it is shipped, a real service,
 // and the events that it stored.
 
+#include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
 #include "tools/pipewire/HeadlessPipeWire.h"
 
@@ -304,9 +305,7 @@ TEST_F(EndToEndTest, ATerminatedReporterStillTellsWhatTheDevicesDid)
 
 TEST_F(EndToEndTest, AnIdleReporterWakesForNothing)
 {
-#ifdef __SANITIZE_THREAD__
-    GTEST_SKIP() << "the sanitizer has a thread of its own that does not rest";
-#endif
+    KESTO_SKIP_WHERE_THREADS_ARE_WATCHED();
     ASSERT_TRUE(reporterSays("connected to the reporting service"));
     auto before = reporterSleeps();
     for (std::uint64_t earlier = 0; earlier != before; earlier = std::exchange(before, reporterSleeps()))
