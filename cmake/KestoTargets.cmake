@@ -30,7 +30,8 @@ if(KESTO_FUZZ)
   if(NOT CMAKE_CXX_COMPILER_ID STREQUAL Clang)
     message(FATAL_ERROR "KESTO_FUZZ needs clang, which brings the fuzzer: cmake --preset fuzz, or ./dev fuzz")
   endif()
-  add_compile_options(-fsanitize=fuzzer-no-link)
+  add_compile_options(-fsanitize=fuzzer-no-link
+                      -fsanitize-ignorelist=${PROJECT_SOURCE_DIR}/cmake/fuzz-ignorelist.txt)
 endif()
 
 find_package(PkgConfig REQUIRED)

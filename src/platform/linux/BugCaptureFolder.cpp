@@ -179,11 +179,11 @@ void BugCaptureFolder::makeRoom(int folder, std::uint64_t bytes) const
         if (capture.bulk)
             bulks.push_back(*capture.bulk);
     bulks.push_back(bytes);
-    std::size_t going = surplus(bulks, limits_.mostWithBulk, limits_.mostBytes);
+    std::size_t tooMany = surplus(bulks, limits_.mostWithBulk, limits_.mostBytes);
     for (const Capture& capture : captures) {
-        if (!capture.bulk || going == 0)
+        if (!capture.bulk || tooMany == 0)
             continue;
-        --going;
+        --tooMany;
         if (const auto opened = openDirectoryAt(folder, capture.name))
             remove(opened->get(), stateName, folder);
     }
