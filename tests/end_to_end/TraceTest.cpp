@@ -166,6 +166,14 @@ protected:
         return place == std::string::npos ? "" : log.substr(place, log.find('\n', place) - place);
     }
 
+    bool openForTracing(kesto::Client& client) const
+    {
+        kesto::Options options;
+        options.socketPath = kestod.socketPath();
+        options.trace = true;
+        return client.open(options) == kesto::Status::Ok;
+    }
+
     const support::RealTracefs tracefs; // before the service, which is to see it
     Kestod kestod{{{"feature-flags.toml", "[Sonalis]\nTracing = true\n"}}};
     const std::filesystem::path parametersPath = kestod.directory() / "parameters.plist";
@@ -177,10 +185,7 @@ protected:
 TEST_F(TraceTest, MeasuresWhatAClientEmitsFromSeveralThreads)
 {
     kesto::Client client;
-    kesto::Options options;
-    options.socketPath = kestod.socketPath();
-    options.trace = true;
-    ASSERT_EQ(client.open(options), kesto::Status::Ok);
+    ASSERT_TRUE(openForTracing(client));
     const kesto::Tracer tracer(client);
     EXPECT_FALSE(tracer.isActive());
 
@@ -223,10 +228,7 @@ TEST_F(TraceTest, MeasuresWhatAClientEmitsFromSeveralThreads)
 TEST_F(TraceTest, MeasuresNothingThatWasEmittedBeforeItsStartOrAfterItsEnd)
 {
     kesto::Client client;
-    kesto::Options options;
-    options.socketPath = kestod.socketPath();
-    options.trace = true;
-    ASSERT_EQ(client.open(options), kesto::Status::Ok);
+    ASSERT_TRUE(openForTracing(client));
     const kesto::Tracer tracer(client);
     const auto emit = [&](std::uint32_t code) { kesto_tracer_emit(tracer.get(), code, 0, 0, 0, 0); };
 

@@ -4,11 +4,13 @@
 #include "foundation/GeneratedValues.h"
 #include "foundation/Hex.h"
 
+#include <algorithm>
 #include <gtest/gtest.h>
 #include <limits>
 #include <rapidcheck/gtest.h>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace foundation {
 namespace {
@@ -141,6 +143,29 @@ TEST(Cbor, ManyKeysAndLongOnesAreReadRightThoughNotRemembered)
     const Dictionary dictionary(std::move(entries));
     for (int turn = 0; turn < 2; ++turn)
         EXPECT_EQ(*decoder.decode(encoded(dictionary)), Value(dictionary));
+}
+
+TEST(Cbor, KeysThatComeInAnotherOrderThanBeforeAreReadRight)
+{
+    CborDecoder decoder;
+    std::vector<std::string> keys{"", "a", "b", "key", std::string(65, 'k')};
+    do {
+        Dictionary::Entries entries;
+        for (const std::string& key : keys)
+            entries.push_back({String(key), static_cast<int>(entries.size())});
+        const Dictionary dictionary(std::move(entries));
+        EXPECT_EQ(encoded(*decoder.decode(encoded(dictionary))), encoded(dictionary));
+    } while (std::ranges::next_permutation(keys).found);
+}
+
+TEST(Cbor, AKeyThatIsNoTextIsRefusedAgainAndAgainWhereAnotherIsExpected)
+{
+    CborDecoder decoder;
+    const Dictionary usual{{"a", 1}, {"b", 2}};
+    for (int turn = 0; turn < 3; ++turn) {
+        EXPECT_EQ(*decoder.decode(encoded(usual)), Value(usual));
+        EXPECT_EQ(decoder.decode("\xA2\x61\x61\x01\x61\xFF\x02").error(), CborError::InvalidUtf8);
+    }
 }
 
 TEST(Cbor, ADecoderGoesOnAfterAnError)

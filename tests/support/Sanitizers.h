@@ -20,5 +20,6 @@ constexpr bool threadSanitizerWatches = __has_feature(thread_sanitizer);
 constexpr bool threadSanitizerWatches = false;
 #endif
 #define KESTO_SKIP_WHERE_THREADS_ARE_WATCHED() \
-    if (threadSanitizerWatches)                \
-    GTEST_SKIP() << "the thread sanitizer has a thread of its own, that does not rest"
+    if (!threadSanitizerWatches) {             \
+    } else                                     \
+        GTEST_SKIP() << "the thread sanitizer has a thread of its own, that does not rest"
