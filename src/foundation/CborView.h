@@ -113,19 +113,6 @@ private:
     std::string_view items_;
 };
 
-// Calls `visit` with key and value of each entry of an encoded dictionary.
-template <typename Visit> void forEachCborEntry(CborItem dictionary, Visit visit)
-{
-    const std::string_view content = dictionary.content();
-    const char* const end = content.data() + content.size();
-    for (const char* place = content.data(); place != end;) {
-        const CborItem key = CborItem::at(place);
-        const CborItem value = CborItem::at(place + key.bytes().size());
-        visit(key.content(), value);
-        place = value.bytes().data() + value.bytes().size();
-    }
-}
-
 inline Value::Kind CborItem::kind() const noexcept
 {
     const CborHead head = headAt(bytes_.data()).head;

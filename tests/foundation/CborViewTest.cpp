@@ -57,11 +57,16 @@ void expectSameThroughout(CborItem item, const Value& value)
     }
     if (const auto dictionary = value.dictionary()) {
         auto entry = dictionary->begin();
-        foundation::forEachCborEntry(item, [&](std::string_view key, CborItem each) {
+        bool isKey = true;
+        for (const CborItem each : CborItems(item)) {
             ASSERT_NE(entry, dictionary->end());
-            EXPECT_EQ(key, entry->key.view());
-            expectSameThroughout(each, entry++->value);
-        });
+            if (isKey)
+                EXPECT_EQ(each.stringView(), entry->key.view());
+            else
+                expectSameThroughout(each, entry++->value);
+            isKey = !isKey;
+        }
+        EXPECT_TRUE(isKey);
         EXPECT_EQ(entry, dictionary->end());
     }
 }
@@ -126,7 +131,7 @@ TEST(CborView, SeesStringsOfEveryWidthOfLength)
 TEST(CborView, SeesNoElementsWhereThereAreNone)
 {
     EXPECT_TRUE(CborItems(CborItem(encoded(Array{}))).begin() == CborItems::end());
-    foundation::forEachCborEntry(CborItem(encoded(Dictionary{})), [](auto, auto) { FAIL(); });
+    EXPECT_TRUE(CborItems(CborItem(encoded(Dictionary{}))).begin() == CborItems::end());
 }
 
 TEST(CborView, GoesOverContainersAsDeepAsTheyAre)
