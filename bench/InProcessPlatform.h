@@ -119,7 +119,7 @@ private:
     };
     class Analytics final : public platform::Analytics {
         [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
-        void sendAnalyticsEventLazy(std::string, PayloadBuilder) override { }
+        void sendAnalyticsEventLazy(std::string_view, PayloadBuilder) override { }
     };
     class FileSystem final : public platform::FileSystem {
         [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return {}; }

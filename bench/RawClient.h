@@ -27,7 +27,7 @@ struct Request {
 class RawClient {
 public:
     // How many requests may wait for their answer in a pipeline.
-    static constexpr std::size_t mostUnanswered = 512;
+    static constexpr std::size_t mostUnanswered = 2048;
 
     // The socket is connected; all answers have the same size.
     RawClient(platform::FileDescriptor socket, Request request, std::size_t answerSize);

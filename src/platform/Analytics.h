@@ -18,7 +18,7 @@ public:
     // Whether some consumer on the device wants events of that name now.
     [[nodiscard]] virtual bool isAnalyticsEventUsed(std::string_view eventName) = 0;
     // Sends an event. The builder is called only if and when the payload is needed, once, on any thread.
-    virtual void sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder) = 0;
+    virtual void sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
 };
 
 } // namespace platform

@@ -93,10 +93,10 @@ bool FakeAnalytics::isAnalyticsEventUsed(std::string_view eventName)
                                [&](const auto& pattern) { return fnmatch(pattern.c_str(), name.c_str(), 0) == 0; });
 }
 
-void FakeAnalytics::sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder)
+void FakeAnalytics::sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder)
 {
     const foundation::Lock lock(lock_);
-    sent_.push_back({std::move(eventName), std::move(payloadBuilder), std::nullopt});
+    sent_.push_back({std::string(eventName), std::move(payloadBuilder), std::nullopt});
 }
 
 } // namespace support

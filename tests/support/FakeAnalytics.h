@@ -43,7 +43,7 @@ public:
     void clear();
 
     bool isAnalyticsEventUsed(std::string_view eventName) override;
-    void sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder) override;
+    void sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder) override;
 
 private:
     struct Sent {

@@ -11,46 +11,29 @@
 namespace platform {
 
 namespace {
-constexpr std::size_t mostRoomKept = 1024; // in events; what a burst needed beyond that is given back
+constexpr std::size_t mostRoomKept = 1024; // in turns that wait; what a burst needed beyond that is given back
 }
 
 // --- Batches
 
-// Two events in a row often share their payload.
-void AnalyticsStore::Batch::add(AnalyticsEvent event)
-{
-    bytes += sizeof event + event.name.size();
-    if (events.empty() || !events.back().payload.isSameObject(event.payload))
-        bytes += event.payload.roughBytes();
-    events.push_back(std::move(event));
-}
-
 void AnalyticsStore::Batch::takeFrom(Batch& other)
 {
-    if (empty()) {
-        std::swap(*this, other);
-        return;
-    }
-    std::ranges::move(other.events, std::back_inserter(events));
+    events.takeFrom(other.events);
     std::ranges::move(other.whenKept, std::back_inserter(whenKept));
-    bytes += other.bytes;
     other.clear();
 }
 
 void AnalyticsStore::Batch::clear()
 {
     events.clear();
-    if (events.capacity() > mostRoomKept)
-        events = std::vector<AnalyticsEvent>();
     whenKept.clear();
     if (whenKept.capacity() > mostRoomKept)
         whenKept = std::vector<WhenKept>();
-    bytes = 0;
 }
 
 bool AnalyticsStore::isRoomIn(const Batch& batch) const noexcept
 {
-    return batch.events.size() + batch.whenKept.size() < limits_.mostEvents && batch.bytes < limits_.mostBytes;
+    return batch.events.size() + batch.whenKept.size() < limits_.mostEvents && batch.events.bytes() < limits_.mostBytes;
 }
 
 // --- What others call
@@ -78,19 +61,20 @@ AnalyticsStore::~AnalyticsStore()
     thread_.join();
 }
 
-void AnalyticsStore::sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder)
+void AnalyticsStore::sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder)
 {
     if (!isAnalyticsEventUsed(eventName)) // of those that ask before, this costs little
         return;
-    AnalyticsEvent event{clock_.secondsSince1970(), std::move(eventName), payloadBuilder()};
+    const double time = clock_.secondsSince1970();
+    const foundation::Dictionary payload = payloadBuilder();
     const foundation::Lock lock(lock_);
     if (SerialQueue::isTurnRunning()) {
-        turn_.add(std::move(event));
+        turn_.events.add(time, eventName, payload);
         if (isRoomIn(turn_))
             return;
         waiting_.takeFrom(turn_); // a turn that is too large is written in parts
     } else {
-        waiting_.add(std::move(event));
+        waiting_.events.add(time, eventName, payload);
     }
     wakeWriter();
     waitForRoom();
@@ -170,12 +154,13 @@ void AnalyticsStore::run()
     for (bool isFirst = true; take(batch); isFirst = false) {
         if (isFirst)
             writer_.open();
+        const bool isQuiet = batch.empty();
         writer_.keep(batch.events);
         for (WhenKept& whenKept : batch.whenKept)
             whenKept();
         finish();
         batch.clear();
-        while (writer_.maintain() && isIdle()) { }
+        while (writer_.maintain(isQuiet) && isIdle()) { }
     }
 }
 
@@ -188,10 +173,9 @@ bool AnalyticsStore::take(Batch& batch)
         while (waiting_.empty() && !newConfiguration_) {
             if (isEnding_)
                 return false;
-            isAsleep_ = true;
-            changed_.wait(lock_);
+            if (!sleep())
+                break; // with nothing, in a quiet moment
         }
-        isAsleep_ = false;
         std::swap(configuration, newConfiguration_);
         std::swap(batch, waiting_);
         isWriting_ = !batch.empty();
@@ -200,6 +184,20 @@ bool AnalyticsStore::take(Batch& batch)
     if (configuration)
         writer_.setConfiguration(*configuration);
     return true;
+}
+
+// False when it became quiet and that was waited for.
+bool AnalyticsStore::sleep()
+{
+    isAsleep_ = true;
+    const auto quiet = std::chrono::steady_clock::now() + quietTime;
+    bool isAwake = true;
+    if (!writer_.awaitsQuiet())
+        changed_.wait(lock_);
+    else
+        isAwake = changed_.waitUntil(lock_, quiet) == std::cv_status::no_timeout;
+    isAsleep_ = false;
+    return isAwake;
 }
 
 void AnalyticsStore::finish()

@@ -9,15 +9,16 @@
 #include "platform/Analytics.h"
 #include "platform/Clock.h"
 #include "platform/linux/ConfigurationWatcher.h"
+#include "platform/linux/EventBatch.h"
 #include "platform/linux/EventWriter.h"
 #include "platform/linux/UsedEventNames.h"
 #include "platform/linux/WatchedTomlFile.h"
 
+#include <chrono>
 #include <cstddef>
 #include <filesystem>
 #include <functional>
 #include <optional>
-#include <string>
 #include <string_view>
 #include <thread>
 #include <vector>
@@ -36,6 +37,9 @@ public:
         std::size_t mostBytes = 4 * 1024 * 1024;
     };
 
+    // After how long without an event it is quiet.
+    static constexpr std::chrono::milliseconds quietTime{50};
+
     // Events go to `EventWriter::fileName` in the state directory; analytics.toml in the configuration directory
     // says which are wanted and for how long they are kept.
     AnalyticsStore(const std::filesystem::path& stateDirectory, ConfigurationWatcher& watcher, const Clock& clock,
@@ -51,7 +55,7 @@ public:
     [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override { return names_.contains(eventName); }
     // Stamps the event with the time and builds its payload at once. An event that a turn sends is written when the
     // turn has ended, any other at once. Blocks only while too much waits to be written.
-    void sendAnalyticsEventLazy(std::string eventName, PayloadBuilder payloadBuilder) override;
+    void sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder) override;
 
     // Ends the turn that the calling thread runs. `whenKept`, unless it is empty, is called once everything sent so
     // far is committed, or counted as lost: here and now when it is, on the store's thread otherwise, one after
@@ -69,12 +73,10 @@ public:
 private:
     // Events, and who waits for them.
     struct Batch {
-        std::vector<AnalyticsEvent> events;
+        EventBatch events;
         std::vector<WhenKept> whenKept;
-        std::size_t bytes = 0; // of the events, roughly
 
-        [[nodiscard]] bool empty() const noexcept { return events.empty() && whenKept.empty(); }
-        void add(AnalyticsEvent event);
+        [[nodiscard]] bool empty() const noexcept { return events.size() == 0 && whenKept.empty(); }
         void takeFrom(Batch& other); // which is then empty
         void clear();
     };
@@ -88,6 +90,7 @@ private:
     // The store's thread.
     void run();
     [[nodiscard]] bool take(Batch& batch);
+    [[nodiscard]] bool sleep() KESTO_REQUIRES(lock_);
     void finish();
     [[nodiscard]] bool isIdle();
 

@@ -2,8 +2,6 @@
 // here gives up for good.
 #include "platform/linux/EventWriter.h"
 
-#include "foundation/Json.h"
-
 #include <algorithm>
 #include <array>
 #include <fmt/chrono.h>
@@ -16,7 +14,6 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr std::size_t mostPayloadRoomKept = 256 * 1024; // in bytes; what a burst needed beyond that is given back
 constexpr std::uint64_t bytesOfARow = 24; // beside its texts, roughly
 constexpr std::uint64_t bytesTidiedAtOnce = 1024 * 1024;
 constexpr double secondsADay = 86400;
@@ -144,28 +141,24 @@ void EventWriter::removeOldestDamaged()
 
 // --- Keeping
 
-void EventWriter::keep(std::span<const AnalyticsEvent> events)
+void EventWriter::keep(EventBatch& events)
 {
-    if (events.empty())
+    if (events.size() == 0)
         return;
-    auto kept = write(events);
-    if (!kept && kept.error() == StoreError::Corrupt)
-        kept = write(events); // into the new one
-    if (kept) {
-        kept_ += *kept;
-        losses_.add(StoreError::NotJson, events.size() - *kept);
-    } else {
-        losses_.add(kept.error(), events.size());
-    }
+    const auto rows = events.rows();
+    losses_.add(StoreError::NotJson, events.size() - rows.size());
+    auto done = write(rows);
+    if (!done && done.error() == StoreError::Corrupt)
+        done = write(rows); // into the new one
+    if (done)
+        kept_ += rows.size();
+    else
+        losses_.add(done.error(), rows.size());
     losses_.report();
-    if (payloads_.capacity() > mostPayloadRoomKept)
-        payloads_ = std::string();
 }
 
-// Returns how many could be written as JSON.
-EventWriter::Expected<std::uint64_t> EventWriter::write(std::span<const AnalyticsEvent> events)
+EventWriter::Expected<> EventWriter::write(std::span<const EventRow> rows)
 {
-    std::uint64_t written = 0;
     const auto writeAll = [&]() -> Expected<> {
         if (const auto done = ensureOpen(); !done)
             return done;
@@ -173,51 +166,18 @@ EventWriter::Expected<std::uint64_t> EventWriter::write(std::span<const Analytic
             return std::unexpected(StoreError::LogHeld);
         if (const auto done = database_->begin(); !done)
             return done;
-        while (!events.empty()) {
-            const std::size_t count = std::min(events.size(), EventDatabase::rowsAtOnce);
-            makeRows(events.first(count));
-            events = events.subspan(count);
-            written += rows_.size();
-            for (const EventRow& row : rows_)
-                bytesSinceCheck_ += bytesOfARow + row.name.size() + row.payload.size();
-            if (const auto done = database_->insert(rows_); !done)
-                return done;
-        }
+        if (const auto done = database_->insert(rows); !done)
+            return done;
         return database_->commit();
     };
     const auto done = writeAll();
-    if (done)
-        return written;
-    handleFailure(done.error());
-    return std::unexpected(done.error());
-}
-
-// One payload often belongs to two events in a row, which are then the same object.
-void EventWriter::makeRows(std::span<const AnalyticsEvent> events)
-{
-    struct Extent {
-        std::size_t begin = 0;
-        std::size_t size = 0;
-    };
-    std::array<Extent, EventDatabase::rowsAtOnce> extents;
-    rows_.clear();
-    payloads_.clear();
-    const AnalyticsEvent* previous = nullptr;
-    for (const AnalyticsEvent& event : events) {
-        Extent& extent = extents[rows_.size()];
-        if (previous != nullptr && previous->payload.isSameObject(event.payload)) {
-            extent = extents[rows_.size() - 1];
-        } else {
-            const std::size_t begin = payloads_.size();
-            if (!foundation::appendJson(event.payload, payloads_))
-                continue;
-            extent = {begin, payloads_.size() - begin};
-        }
-        previous = &event;
-        rows_.push_back({event.time, event.name, {}});
+    if (!done) {
+        handleFailure(done.error());
+        return done;
     }
-    for (std::size_t row = 0; row < rows_.size(); ++row) // now that the text does not move any more
-        rows_[row].payload = std::string_view(payloads_).substr(extents[row].begin, extents[row].size);
+    for (const EventRow& row : rows)
+        bytesSinceCheck_ += bytesOfARow + row.name.size() + row.payload.size();
+    return done;
 }
 
 void EventWriter::handleFailure(StoreError error)
@@ -234,20 +194,30 @@ void EventWriter::handleFailure(StoreError error)
 
 // --- Housekeeping
 
-bool EventWriter::maintain()
+bool EventWriter::awaitsQuiet() const
+{
+    return database_ && isLogLongerBy(logBytesBetweenCheckpoints);
+}
+
+bool EventWriter::maintain(bool isQuiet)
 {
     losses_.report();
     if (!database_)
         return false;
-    const std::uint64_t logBytes = database_->logBytes();
-    if (logBytes < logBytesAtCheckpoint_)
+    if (database_->logBytes() < logBytesAtCheckpoint_)
         logBytesAtCheckpoint_ = 0; // it began anew
-    if (logBytes - logBytesAtCheckpoint_ >= std::min(logBytesBetweenCheckpoints, maximumBytes() / 4))
+    if (isLogLongerBy(isQuiet ? logBytesBetweenCheckpoints : mostLogBytesBetweenCheckpoints))
         emptyLog();
     const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
         || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
     hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && tidy(); // tidying makes the log longer
     return hasMoreToTidy_;
+}
+
+// Than at the last checkpoint.
+bool EventWriter::isLogLongerBy(std::uint64_t bytes) const
+{
+    return database_->logBytes() >= logBytesAtCheckpoint_ + std::min(bytes, maximumBytes() / 4);
 }
 
 bool EventWriter::emptyLog()

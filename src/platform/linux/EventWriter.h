@@ -2,9 +2,9 @@
 // kept is counted and told, and what is too old or too much goes.
 #pragma once
 
-#include "foundation/Value.h"
 #include "platform/Clock.h"
 #include "platform/linux/AnalyticsConfiguration.h"
+#include "platform/linux/EventBatch.h"
 #include "platform/linux/EventDatabase.h"
 #include "platform/linux/EventLosses.h"
 #include "platform/linux/ProviderLog.h"
@@ -14,16 +14,9 @@
 #include <filesystem>
 #include <memory>
 #include <span>
-#include <string>
-#include <vector>
+#include <string_view>
 
 namespace platform {
-
-struct AnalyticsEvent {
-    double time = 0; // seconds since 1970 UTC
-    std::string name;
-    foundation::Dictionary payload;
-};
 
 // One thread, but for the counts.
 class EventWriter {
@@ -31,9 +24,11 @@ public:
     static constexpr std::string_view fileName = "analytics.sqlite3";
     static constexpr std::size_t mostDamagedKept = 3; // databases set aside; older ones are removed
     static constexpr double secondsBetweenOpenings = 1; // of a database that could not be opened
-    // How long the write-ahead log gets before it is moved to the database, unless a quarter of the bound of size
-    // is less. What is moved at once holds up the next commit.
+    // How long the write-ahead log gets before it is moved to the database in a quiet moment, and before it is moved
+    // come what may, unless a quarter of the bound of size is less. The next commit waits until it is moved, which
+    // takes about as long as writing the log did.
     static constexpr std::uint64_t logBytesBetweenCheckpoints = 8 * 1024 * 1024;
+    static constexpr std::uint64_t mostLogBytesBetweenCheckpoints = 4 * logBytesBetweenCheckpoints;
     // When the log is longer than half the bound of size, because readers keep it from beginning anew, the writer
     // waits for them so long; when that was in vain, not again for a while. A log as long as the bound takes no more.
     static constexpr std::chrono::milliseconds waitForReaders{200};
@@ -51,9 +46,12 @@ public:
     // Opens the database, so that it is there before the first event.
     void open();
     // Keeps the events in one transaction; they are committed, or counted as lost, when this returns.
-    void keep(std::span<const AnalyticsEvent> events);
-    // Does some of the housekeeping that is due; true when more is left to do.
-    bool maintain();
+    void keep(EventBatch& events);
+    // Whether some housekeeping waits for a quiet moment.
+    [[nodiscard]] bool awaitsQuiet() const;
+    // Does some of the housekeeping that is due; true when more is left to do. `isQuiet`: nothing was to be kept for a
+    // while.
+    bool maintain(bool isQuiet);
 
     // Any thread.
     [[nodiscard]] std::uint64_t keptEvents() const noexcept { return kept_; }
@@ -66,9 +64,9 @@ private:
     [[nodiscard]] Expected<> openAnew();
     bool setAside(StoreError reason);
     void removeOldestDamaged();
-    [[nodiscard]] Expected<std::uint64_t> write(std::span<const AnalyticsEvent> events);
-    void makeRows(std::span<const AnalyticsEvent> events);
+    [[nodiscard]] Expected<> write(std::span<const EventRow> rows);
     void handleFailure(StoreError error);
+    [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     bool emptyLog();
     [[nodiscard]] bool tidy();
     [[nodiscard]] Expected<bool> tidySome(const EventDatabase::Size& size);
@@ -89,9 +87,6 @@ private:
     double checkedAt_ = 0; // the bounds of age and size
     std::uint64_t bytesSinceCheck_ = 0;
     bool hasMoreToTidy_ = true;
-
-    std::vector<EventRow> rows_;
-    std::string payloads_; // of `rows_`
 };
 
 } // namespace platform

@@ -359,6 +359,18 @@ TEST_F(AnalyticsStoreTest, ATurnLargerThanTheBacklogIsKeptWhole)
     EXPECT_EQ(stored.get_future().get(), 1000);
 }
 
+TEST_F(AnalyticsStoreTest, ALongLogIsMovedToTheDatabaseOnceItIsQuiet)
+{
+    constexpr std::uintmax_t megabyte = 1024 * 1024;
+    for (int number = 0; number < 120; ++number)
+        store().sendAnalyticsEventLazy(eventName, [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
+    store().flush();
+    for (int tries = 0; tries < 1000 && fs::file_size(file) < 8 * megabyte; ++tries)
+        std::this_thread::sleep_for(10ms);
+    EXPECT_GT(fs::file_size(file), 8 * megabyte);
+    EXPECT_EQ(storedEvents(), 120);
+}
+
 // --- The death of the service
 
 TEST_F(AnalyticsStoreTest, KillingTheServiceLosesNothingThatWasAcknowledged)

@@ -40,6 +40,12 @@ namespace fs = std::filesystem;
 
 constexpr std::uint64_t megabyte = 1024 * 1024;
 
+struct AnalyticsEvent {
+    double time = 0;
+    std::string name;
+    Dictionary payload;
+};
+
 AnalyticsEvent event(double time, std::string name = "com.quarn.kesto.Playback.Start",
                      Dictionary payload = {{"key", 1}})
 {
@@ -63,11 +69,19 @@ protected:
         return *writer_;
     }
     void closeWriter() { writer_.reset(); }
-    void keep(std::vector<AnalyticsEvent> given) { writer().keep(given); }
-    void maintain()
+    static void keepIn(EventWriter& writer, const std::vector<AnalyticsEvent>& given)
     {
-        while (writer().maintain()) { }
+        EventBatch batch;
+        for (const auto& [time, name, payload] : given)
+            batch.add(time, name, payload);
+        writer.keep(batch);
     }
+    void keep(const std::vector<AnalyticsEvent>& given) { keepIn(writer(), given); }
+    void maintain(bool isQuiet = true)
+    {
+        while (writer().maintain(isQuiet)) { }
+    }
+    std::uint64_t logBytes() const { return fs::file_size(directory / "analytics.sqlite3-wal"); }
     [[nodiscard]] std::vector<std::string> filesNamed(std::string_view part) const
     {
         std::vector<std::string> names;
@@ -123,7 +137,7 @@ TEST_F(EventWriterTest, NumbersOfRowsOnEverySideOfTheStatementsSize)
         std::vector<AnalyticsEvent> given;
         for (std::size_t number = 0; number < count; ++number)
             given.push_back(event(1, "a", {{"n", number}}));
-        keep(std::move(given));
+        keep(given);
         expected += static_cast<std::int64_t>(count);
         StoreReader reader(file());
         ASSERT_EQ(reader.eventCount(), expected);
@@ -348,11 +362,11 @@ TEST_F(EventWriterTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
                                         HasSubstr("another process keeps its events in the same directory; "
                                                   "give each service its own state directory")))));
     const std::vector<AnalyticsEvent> given{event(2, "second")};
-    second.keep(given);
+    keepIn(second, given);
     EXPECT_EQ(second.losses().count(StoreError::InUse), 1U);
     closeWriter();
     clock.advance(EventWriter::secondsBetweenOpenings);
-    second.keep(given);
+    keepIn(second, given);
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("first", "second"));
 }
 
@@ -552,11 +566,52 @@ TEST_F(EventWriterTest, TheLogIsMovedToTheDatabaseBeforeItGrowsLarge)
     for (int round = 0; round < 100; ++round) {
         keep(events(2000));
         maintain();
-        ASSERT_LT(fs::file_size(directory / "analytics.sqlite3-wal"), 2 * EventWriter::logBytesBetweenCheckpoints);
+        ASSERT_LT(logBytes(), 2 * EventWriter::logBytesBetweenCheckpoints);
         if (round % 10 == 0)
             reader.eventCount();
     }
     EXPECT_GT(fs::file_size(file()), 50 * megabyte);
+}
+
+TEST_F(EventWriterTest, AMoreThanLongLogIsMovedEvenWhileThereIsMuchToKeep)
+{
+    writer().open();
+    std::uint64_t longest = 0;
+    for (int round = 0; round < 100; ++round) {
+        keep(events(2000));
+        longest = std::max(longest, logBytes());
+        maintain(false);
+    }
+    EXPECT_GT(longest, EventWriter::mostLogBytesBetweenCheckpoints);
+    EXPECT_LT(longest, EventWriter::mostLogBytesBetweenCheckpoints + 2 * megabyte);
+    EXPECT_GT(fs::file_size(file()), 20 * megabyte);
+}
+
+TEST_F(EventWriterTest, ALongLogIsMovedOnlyInAQuietMoment)
+{
+    writer().open();
+    EXPECT_FALSE(writer().awaitsQuiet());
+    for (int round = 0; round < 15; ++round)
+        keep(events(2000));
+    maintain(false);
+    EXPECT_LT(fs::file_size(file()), megabyte);
+    EXPECT_TRUE(writer().awaitsQuiet());
+    maintain(true);
+    EXPECT_GT(fs::file_size(file()), 8 * megabyte);
+    EXPECT_FALSE(writer().awaitsQuiet());
+}
+
+TEST_F(EventWriterTest, ALogThatAReaderHoldsIsNotWaitedForAgainAndAgain)
+{
+    writer().open();
+    StoreReader reader(file());
+    reader.execute("BEGIN");
+    EXPECT_EQ(reader.eventCount(), 0);
+    for (int round = 0; round < 15; ++round)
+        keep(events(2000));
+    EXPECT_TRUE(writer().awaitsQuiet());
+    maintain(true);
+    EXPECT_FALSE(writer().awaitsQuiet());
 }
 
 TEST_F(EventWriterTest, AReaderThatNeverEndsCostsEventsButNotTheDisk)
@@ -569,7 +624,7 @@ TEST_F(EventWriterTest, AReaderThatNeverEndsCostsEventsButNotTheDisk)
     for (int round = 0; round < 60; ++round) {
         keep(events(1000));
         maintain();
-        ASSERT_LT(fs::file_size(directory / "analytics.sqlite3-wal"), 14 * megabyte);
+        ASSERT_LT(logBytes(), 14 * megabyte);
     }
     EXPECT_GT(lost(StoreError::LogHeld), 0U);
     EXPECT_THAT(log.take(),
@@ -610,7 +665,7 @@ TEST_F(EventWriterTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginning
         maintain();
     }
     EXPECT_EQ(lost(StoreError::LogHeld), 0U);
-    EXPECT_LT(fs::file_size(directory / "analytics.sqlite3-wal"), 5 * megabyte);
+    EXPECT_LT(logBytes(), 5 * megabyte);
 }
 
 TEST_F(EventWriterTest, AProgramThatWritesHoldsUpTheStoreButNotForEver)
@@ -714,7 +769,7 @@ TEST_F(EventWriterTest, HousekeepingIsDoneInSmallSteps)
     configuration.maximumSizeMegabytes = 1;
     writer().setConfiguration(configuration);
     int steps = 1;
-    while (writer().maintain())
+    while (writer().maintain(true))
         ++steps;
     EXPECT_GT(steps, 15);
 }

@@ -1,0 +1,106 @@
+// All texts stand in one buffer, behind each other: an event costs no allocation.
+#include "platform/linux/EventBatch.h"
+
+#include "foundation/Json.h"
+
+#include <iterator>
+#include <utility>
+
+namespace platform {
+namespace {
+
+// What a burst needed beyond that is given back.
+constexpr std::size_t mostBytesKept = 256 * 1024;
+constexpr std::size_t mostElementsKept = 1024;
+
+void clear(std::string& text)
+{
+    text.clear();
+    if (text.capacity() > mostBytesKept)
+        text = std::string();
+}
+
+template <typename Element> void clear(std::vector<Element>& elements)
+{
+    elements.clear();
+    if (elements.capacity() > mostElementsKept)
+        elements = std::vector<Element>();
+}
+
+} // namespace
+
+void EventBatch::add(double time, std::string_view name, const foundation::Dictionary& payload)
+{
+    if (payloads_.empty() || !payload.isSameObject(lastPayload_)) {
+        lastPayload_ = payload;
+        const std::size_t bytes = payload.roughBytes();
+        if (bytes > largestWrittenAtOnce) {
+            waitingBytes_ += bytes;
+            payloads_.push_back({{}, payload});
+        } else {
+            payloads_.push_back({write(payload), {}});
+        }
+    }
+    events_.push_back({time, {texts_.size(), name.size()}, payloads_.size() - 1});
+    texts_ += name;
+}
+
+void EventBatch::takeFrom(EventBatch& other)
+{
+    if (events_.empty())
+        std::swap(*this, other);
+    for (Event event : other.events_) {
+        event.name.begin += texts_.size();
+        event.payload += payloads_.size();
+        events_.push_back(event);
+    }
+    for (Payload& payload : other.payloads_) {
+        payload.json.begin += texts_.size();
+        payloads_.push_back(std::move(payload));
+    }
+    texts_ += other.texts_;
+    waitingBytes_ += other.waitingBytes_;
+    if (!other.payloads_.empty())
+        lastPayload_ = other.lastPayload_;
+    other.clear();
+}
+
+void EventBatch::clear()
+{
+    platform::clear(events_);
+    platform::clear(payloads_);
+    platform::clear(texts_);
+    platform::clear(rows_);
+    lastPayload_ = {};
+    waitingBytes_ = 0;
+}
+
+std::size_t EventBatch::bytes() const noexcept
+{
+    return events_.size() * sizeof(Event) + texts_.size() + waitingBytes_;
+}
+
+std::span<const EventRow> EventBatch::rows()
+{
+    for (Payload& payload : payloads_)
+        if (const auto waiting = std::exchange(payload.waiting, {}); !waiting.empty())
+            payload.json = write(waiting);
+    rows_.clear();
+    for (const auto& [time, name, payload] : events_)
+        if (const auto& json = payloads_[payload].json; json.size != 0)
+            rows_.push_back({time, view(name), view(json)});
+    return rows_;
+}
+
+EventBatch::Text EventBatch::write(const foundation::Dictionary& payload)
+{
+    const std::size_t begin = texts_.size();
+    return foundation::appendJson(payload, texts_) ? Text{begin, texts_.size() - begin} : Text();
+}
+
+std::string_view EventBatch::view(const Text& text) const
+{
+    return std::string_view(texts_).substr(text.begin, text.size);
+}
+
+} // namespace platform
