@@ -1,5 +1,6 @@
 // The CBOR decoder reads what any process on the machine may send. Whatever the bytes, it must end with a value
-// or an error; and a value that it gave must survive its own encoding, byte for byte the second time.
+// or an error, whatever it read before; and a value that it gave must survive its own encoding, byte for byte the
+// second time.
 #include "foundation/Cbor.h"
 
 #include <cstdint>
@@ -14,21 +15,29 @@ void require(bool holds)
         std::abort();
 }
 
+std::string encodedOf(const foundation::Value& value)
+{
+    std::string encoded;
+    foundation::appendCbor(value, encoded);
+    return encoded;
+}
+
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
-    static foundation::CborDecoder decoder; // as on a connection: it remembers keys from earlier frames
-    const auto decoded = decoder.decode({reinterpret_cast<const char*>(data), size});
+    static foundation::CborDecoder decoder; // as on a connection: it remembers keys and shapes from earlier frames
+    const std::string_view bytes(reinterpret_cast<const char*>(data), size);
+    const auto decoded = decoder.decode(bytes);
+    const auto decodedFresh = foundation::CborDecoder().decode(bytes);
+    require(decoded.has_value() == decodedFresh.has_value());
     if (!decoded)
         return 0;
-    std::string encoded;
-    foundation::appendCbor(*decoded, encoded);
+    const std::string encoded = encodedOf(*decoded);
+    require(encoded == encodedOf(*decodedFresh)); // stronger than equality of the values, which NaN never has
     const auto again = decoder.decode(encoded);
     require(again.has_value());
-    std::string reencoded;
-    foundation::appendCbor(*again, reencoded);
-    require(encoded == reencoded); // stronger than equality of the values, which NaN never has
+    require(encoded == encodedOf(*again));
 
     static_cast<void>(decoded->text()); // what a log line or the store would write of it
     return 0;

@@ -20,21 +20,13 @@ using platform::Connection;
 // that the call is done with.
 class ReplyAddress {
 public:
-    ReplyAddress(std::weak_ptr<Connection> connection, std::uint64_t call, std::shared_ptr<void> credit)
-        : connection_(std::move(connection)),
-          call_(call),
-          credit_(std::move(credit))
-    {
-    }
+    ReplyAddress(std::shared_ptr<Connection> caller, std::uint64_t call) : caller_(std::move(caller)), call_(call) { }
 
     // [call, error, values...], the values appended by `appendValues`.
     template <typename AppendValues>
     void answer(const std::optional<KestoReportingError>& error, std::uint64_t valueCount,
                 AppendValues appendValues) const
     {
-        const auto connection = connection_.lock();
-        if (!connection)
-            return;
         std::string frame;
         foundation::appendCborArrayHead(2 + valueCount, frame);
         foundation::appendCborInteger(call_, frame);
@@ -43,7 +35,7 @@ public:
         else
             foundation::appendCborNull(frame);
         appendValues(frame);
-        connection->send(std::move(frame));
+        caller_->send(std::move(frame));
     }
 
     // A reply callback with one value, and one with none.
@@ -61,9 +53,8 @@ public:
     }
 
 private:
-    std::weak_ptr<Connection> connection_;
+    std::shared_ptr<Connection> caller_;
     std::uint64_t call_;
-    std::shared_ptr<void> credit_;
 };
 
 // Takes the arguments of one call in order. What does not fit is remembered, and what was taken then is not used.
@@ -211,8 +202,6 @@ std::unexpected<Connection::Violation> violation(std::string reason)
 std::expected<void, Connection::Violation> KestoReportingServiceProtocolAdapter::handleCall(Connection::Call call)
 {
     constexpr std::size_t headCount = 2; // the call's number and the method's
-    if (connection_.expired())
-        return {};
     const std::span<const Value> values = call.frame.values();
     if (values.size() < headCount)
         return violation("a call is an array of a number, a method and its arguments");
@@ -230,7 +219,7 @@ std::expected<void, Connection::Violation> KestoReportingServiceProtocolAdapter:
                                             values.size() - headCount));
 
     Arguments arguments(values.subspan(headCount));
-    method.call(*exportedObject_, arguments, ReplyAddress(connection_, *callNumber, std::move(call.credit)));
+    method.call(*exportedObject_, arguments, ReplyAddress(std::move(call.caller), *callNumber));
     if (arguments.refusal())
         return violation(foundation::format("{}: {}", method.name, *arguments.refusal()));
     return {};

@@ -17,11 +17,9 @@ public:
     // A message to more is refused: each of them is worth as much work as the message, and takes a byte of the frame.
     static constexpr std::size_t mostReportersOfAMessage = 10'000;
 
-    // Calls go to the exported object, replies to the connection as long as it lives.
-    KestoReportingServiceProtocolAdapter(std::shared_ptr<KestoReportingServiceProtocol> exportedObject,
-                                         const std::shared_ptr<platform::Connection>& connection)
-        : exportedObject_(std::move(exportedObject)),
-          connection_(connection)
+    // Calls go to the exported object.
+    explicit KestoReportingServiceProtocolAdapter(std::shared_ptr<KestoReportingServiceProtocol> exportedObject)
+        : exportedObject_(std::move(exportedObject))
     {
     }
 
@@ -30,5 +28,4 @@ public:
 
 private:
     std::shared_ptr<KestoReportingServiceProtocol> exportedObject_;
-    std::weak_ptr<platform::Connection> connection_;
 };

@@ -228,6 +228,72 @@ std::size_t cborSize(const Dictionary& dictionary)
     return encoded.size();
 }
 
+namespace {
+
+// The keys of a map that is being read. While they are those of a shape that came before, none is made.
+class MapKeys {
+public:
+    [[nodiscard]] bool empty() const { return taken_ == 0 && own_.empty(); }
+
+    // Looks for the shape at this place, and leaves there what comes instead.
+    void expect(Reference<DictionaryShape>& place)
+    {
+        place_ = &place;
+        expected_ = place;
+    }
+
+    // Whether this is the key that is expected next.
+    bool takeExpected(std::string_view key)
+    {
+        if (!own_.empty() || !expected_ || taken_ == expected_->keys().size() || expected_->keys()[taken_] != key)
+            return false;
+        ++taken_;
+        return true;
+    }
+
+    void add(String key)
+    {
+        leaveExpected();
+        own_.push_back(std::move(key));
+    }
+
+    // What they make of as many values.
+    Dictionary dictionary(std::span<Value> values) &&
+    {
+        if (empty())
+            return {};
+        if (own_.empty() && taken_ == expected_->keys().size())
+            return {std::move(expected_), values};
+        leaveExpected();
+        Dictionary dictionary(std::move(own_), values);
+        if (dictionary.shape()->isSmall())
+            *place_ = dictionary.shape();
+        return dictionary;
+    }
+
+private:
+    void leaveExpected()
+    {
+        if (own_.empty() && taken_ != 0)
+            own_.assign(expected_->keys().begin(), expected_->keys().begin() + static_cast<std::ptrdiff_t>(taken_));
+    }
+
+    Reference<DictionaryShape>* place_ = nullptr;
+    Reference<DictionaryShape> expected_;
+    std::size_t taken_ = 0; // of the expected keys
+    std::vector<String> own_; // all of them, once one was not expected
+};
+
+// What the containers that are being read have so far, one behind the other. One a thread rather than one a decoder,
+// of which there are as many as clients.
+std::vector<Value>& unfinishedValues()
+{
+    thread_local std::vector<Value> values;
+    return values;
+}
+
+} // namespace
+
 // Reads one item after the other. The first error empties the rest, so that every loop ends by itself, and
 // is what `readAll` returns.
 class CborReader {
@@ -237,6 +303,8 @@ public:
     std::expected<Value, CborError> readAll(unsigned maximumDepth)
     {
         Value value = readItem(maximumDepth);
+        if (constexpr std::size_t mostRoomKept = 4096; values_.capacity() > mostRoomKept)
+            values_ = std::vector<Value>();
         if (error_)
             return std::unexpected(*error_);
         if (!rest_.empty())
@@ -387,48 +455,47 @@ private:
         return text;
     }
 
-    // A key that is remembered was looked at when it came first.
-    String readKey()
+    // One that is expected or remembered was looked at when it came first.
+    void readKey(const Head& map, MapKeys& keys)
     {
         const Head head = readHead();
-        if (head.major != Major::Text) {
-            fail(CborError::KeyNotText);
-            return {};
-        }
+        if (head.major != Major::Text)
+            return fail(CborError::KeyNotText);
         const std::string_view key = readBytes(head);
+        if (error_)
+            return;
+        if (keys.empty())
+            keys.expect(decoder_.shapeOf(key, map.argument));
+        if (keys.takeExpected(key))
+            return;
         if (const String* const known = decoder_.find(key))
-            return *known;
-        if (!isText(head, key)) {
-            fail(CborError::InvalidUtf8);
-            return {};
-        }
-        return decoder_.remember(key);
-    }
-
-    // Room for what a container claims to hold, as long as the claim is modest: it is not to be trusted.
-    [[nodiscard]] static std::size_t plausibleCount(const Head& head) noexcept
-    {
-        constexpr std::uint64_t mostReserved = 128;
-        return static_cast<std::size_t>(std::min(head.argument, mostReserved));
+            return keys.add(*known);
+        if (!isText(head, key))
+            return fail(CborError::InvalidUtf8);
+        keys.add(decoder_.remember(key));
     }
 
     Value readArray(const Head& head, unsigned depth)
     {
-        std::vector<Value> values;
-        values.reserve(plausibleCount(head));
-        readElements(head, [&] { values.push_back(readItem(depth)); });
-        return Array(std::move(values));
+        const std::size_t begin = values_.size();
+        readElements(head, [&] { values_.push_back(readItem(depth)); });
+        Array array(std::span<Value>(values_).subspan(begin));
+        values_.resize(begin);
+        return array;
     }
 
     Value readMap(const Head& head, unsigned depth)
     {
-        Dictionary::Entries entries;
-        entries.reserve(plausibleCount(head));
+        const std::size_t begin = values_.size();
+        MapKeys keys;
         readElements(head, [&] {
-            String key = readKey();
-            entries.push_back({std::move(key), readItem(depth)});
+            readKey(head, keys);
+            if (!error_)
+                values_.push_back(readItem(depth));
         });
-        return Dictionary(std::move(entries));
+        Dictionary dictionary = std::move(keys).dictionary(std::span<Value>(values_).subspan(begin));
+        values_.resize(begin);
+        return dictionary;
     }
 
     Value readTagged(const Head& head)
@@ -445,6 +512,7 @@ private:
     CborDecoder& decoder_;
     std::optional<CborError> error_;
     std::string chunks_;
+    std::vector<Value>& values_ = unfinishedValues();
 };
 
 std::expected<Value, CborError> CborDecoder::decode(std::string_view bytes, unsigned maximumDepth)
@@ -478,24 +546,26 @@ std::uint64_t hashOf(std::string_view key) noexcept
 
 } // namespace
 
-// Messages repeat not only their keys but also their order: the one that followed the last one is looked at first.
-const String* CborDecoder::find(std::string_view key)
+const String* CborDecoder::find(std::string_view key) const
 {
-    if (!isRemembered(key))
+    if (key.empty() || keys_.empty())
         return nullptr;
-    if (keys_.empty())
-        keys_.resize(rememberedKeys);
-    std::uint8_t& follower = followers_[last_];
-    last_ = follower;
-    if (keys_[last_] == key)
-        return &keys_[last_];
-    last_ = follower = static_cast<std::uint8_t>(hashOf(key) % rememberedKeys);
-    return keys_[last_] == key ? &keys_[last_] : nullptr;
+    const String& known = keys_[hashOf(key) % rememberedKeys];
+    return known == key ? &known : nullptr;
 }
 
 String CborDecoder::remember(std::string_view key)
 {
-    return isRemembered(key) ? keys_[last_] = String(key) : String(key);
+    if (key.empty() || key.size() > longestRememberedKey)
+        return key;
+    if (keys_.empty())
+        keys_.resize(rememberedKeys);
+    return keys_[hashOf(key) % rememberedKeys] = String(key);
+}
+
+Reference<DictionaryShape>& CborDecoder::shapeOf(std::string_view firstKey, std::uint64_t count)
+{
+    return shapes_[(hashOf(firstKey) + count) % rememberedShapes];
 }
 
 } // namespace foundation

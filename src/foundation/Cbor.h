@@ -55,8 +55,8 @@ inline void appendCborNull(std::string& out)
     out.push_back('\xF6');
 }
 
-// Decodes items from foreign bytes. One decoder a connection, used by one thread at a time: it remembers
-// short keys, so that the keys which every message repeats are made once.
+// Decodes items from foreign bytes. One decoder a connection, used by one thread at a time: it remembers short keys and
+// the shapes of small maps, so that what every message repeats is made once.
 class CborDecoder {
 public:
     // The one item that the bytes hold, all of them, with at most so many containers inside each other.
@@ -65,21 +65,19 @@ public:
 
 private:
     friend class CborReader;
-    // The remembered string with these characters, or null.
-    [[nodiscard]] const String* find(std::string_view key);
-    // A new string, remembered for the next time where `find` has just looked for it.
+    // A string with these characters, if it is remembered.
+    [[nodiscard]] const String* find(std::string_view key) const;
+    // A new string, remembered if it is short.
     [[nodiscard]] String remember(std::string_view key);
 
-    [[nodiscard]] static bool isRemembered(std::string_view key) noexcept
-    {
-        return !key.empty() && key.size() <= longestRememberedKey;
-    }
+    // The place of the shape of a map of so many entries that begins with that key.
+    [[nodiscard]] Reference<DictionaryShape>& shapeOf(std::string_view firstKey, std::uint64_t count);
 
     static constexpr std::size_t longestRememberedKey = 64;
     static constexpr std::size_t rememberedKeys = 256;
+    static constexpr std::size_t rememberedShapes = 16;
     std::vector<String> keys_; // from the first key on, by a hash of their characters; a newcomer takes the place
-    std::array<std::uint8_t, rememberedKeys> followers_{}; // by place, that of the key which came next
-    std::uint8_t last_ = 0; // place
+    std::array<Reference<DictionaryShape>, rememberedShapes> shapes_; // by a hash, too
 };
 
 } // namespace foundation

@@ -12,6 +12,7 @@
 #include <ctime>
 #include <fmt/chrono.h>
 #include <iterator>
+#include <memory>
 #include <numeric>
 
 namespace foundation {
@@ -155,11 +156,46 @@ bool operator==(const Value& left, const Value& right) noexcept
     }
 }
 
-// --- Array
+// --- Values behind an object
 
-Array::Array(std::vector<Value> values)
-    : object_(Reference<ArrayObject>::adopt(values.empty() ? nullptr : new ArrayObject(std::move(values))))
+namespace {
+
+// Memory for the object, with the values moved to where they stand behind it.
+template <typename Object> void* allocateWith(std::span<Value> values)
 {
+    static_assert(sizeof(Object) % alignof(Value) == 0);
+    void* const memory = ::operator new(sizeof(Object) + values.size_bytes());
+    std::uninitialized_move(values.begin(), values.end(), reinterpret_cast<Value*>(static_cast<Object*>(memory) + 1));
+    return memory;
+}
+
+template <typename Object> void destroyWithValues(const Object* object) noexcept
+{
+    std::ranges::destroy(object->values());
+    object->~Object();
+    ::operator delete(const_cast<Object*>(object));
+}
+
+} // namespace
+
+const ArrayObject* ArrayObject::create(std::span<Value> values)
+{
+    return values.empty() ? nullptr : new (allocateWith<ArrayObject>(values)) ArrayObject(values.size());
+}
+
+void ArrayObject::destroy(const ArrayObject* object) noexcept
+{
+    destroyWithValues(object);
+}
+
+const DictionaryObject* DictionaryObject::create(Reference<DictionaryShape> shape, std::span<Value> values)
+{
+    return values.empty() ? nullptr : new (allocateWith<DictionaryObject>(values)) DictionaryObject(std::move(shape));
+}
+
+void DictionaryObject::destroy(const DictionaryObject* object) noexcept
+{
+    destroyWithValues(object);
 }
 
 bool operator==(const Array& left, const Array& right) noexcept
@@ -169,104 +205,48 @@ bool operator==(const Array& left, const Array& right) noexcept
 
 // --- Dictionary
 
-DictionaryObject::DictionaryObject(std::vector<DictionaryEntry> given) : entries_(std::move(given))
+Dictionary::Dictionary(std::vector<String> keys, std::span<Value> values)
 {
-    // Up to here comparing the keys one by one beats any index.
-    constexpr std::size_t mostUnindexed = 16;
-    if (entries_.size() <= mostUnindexed)
-        foldRepetitions();
-    else
-        indexAndFoldRepetitions();
-}
-
-const Value* DictionaryObject::find(std::string_view key) const noexcept
-{
-    if (byKey_.empty()) {
-        const auto found = std::ranges::find(entries_, key, [](const auto& entry) { return entry.key.view(); });
-        return found == entries_.end() ? nullptr : &found->value;
-    }
-    const auto found = std::ranges::lower_bound(byKey_, key, {}, [this](auto position) { return keyAt(position); });
-    return found == byKey_.end() || keyAt(*found) != key ? nullptr : &entries_[*found].value;
-}
-
-namespace {
-
-// Tells most keys apart without looking at all of their characters: a number below 64.
-unsigned fingerprint(std::string_view key) noexcept
-{
-    if (key.empty())
-        return 0;
-    const auto at = [key](std::size_t index) { return static_cast<std::uint8_t>(key[index]); };
-    return (static_cast<unsigned>(key.size()) + 5U * at(0) + 11U * at(key.size() / 2) + 23U * at(key.size() - 1)) % 64;
-}
-
-} // namespace
-
-// Nearly always nothing is repeated, and the fingerprints show it.
-void DictionaryObject::foldRepetitions()
-{
-    std::uint64_t seen = 0;
-    auto kept = entries_.begin();
-    for (auto entry = entries_.begin(); entry != entries_.end(); ++entry) {
-        const std::uint64_t bit = std::uint64_t{1} << fingerprint(entry->key);
-        const auto earlier = (seen & bit) == 0
-            ? kept
-            : std::find_if(entries_.begin(), kept, [&](const auto& other) { return other.key == entry->key; });
-        seen |= bit;
-        if (earlier != kept)
-            earlier->value = std::move(entry->value);
-        else if (kept++ != entry)
-            *std::prev(kept) = std::move(*entry);
-    }
-    entries_.erase(kept, entries_.end());
-}
-
-void DictionaryObject::indexKeys()
-{
-    byKey_.resize(entries_.size());
-    std::iota(byKey_.begin(), byKey_.end(), 0U);
-    std::ranges::sort(byKey_, {}, [this](auto position) { return std::pair(keyAt(position), position); });
-}
-
-void DictionaryObject::indexAndFoldRepetitions()
-{
-    indexKeys();
-    std::vector<bool> repeats(entries_.size());
-    bool any = false;
-    for (std::size_t first = 0, next = 1; next < byKey_.size(); ++next) {
-        if (keyAt(byKey_[next]) != keyAt(byKey_[first])) {
-            first = next;
-            continue;
-        }
-        entries_[byKey_[first]].value = std::move(entries_[byKey_[next]].value);
-        any = repeats[byKey_[next]] = true;
-    }
-    if (!any)
-        return;
-    std::vector<DictionaryEntry> distinct;
-    for (std::size_t position = 0; position < entries_.size(); ++position)
-        if (!repeats[position])
-            distinct.push_back(std::move(entries_[position]));
-    entries_ = std::move(distinct);
-    indexKeys();
+    const std::size_t distinct = foldRepeatedKeys(keys, values);
+    keys.resize(distinct);
+    if (distinct != 0)
+        *this = Dictionary(DictionaryShape::make(std::move(keys)), values.first(distinct));
 }
 
 Dictionary::Dictionary(Entries entries)
-    : object_(Reference<DictionaryObject>::adopt(entries.empty() ? nullptr : new DictionaryObject(std::move(entries))))
 {
+    std::vector<String> keys;
+    std::vector<Value> values;
+    keys.reserve(entries.size());
+    values.reserve(entries.size());
+    for (auto& [key, value] : entries) {
+        keys.push_back(std::move(key));
+        values.push_back(std::move(value));
+    }
+    *this = Dictionary(std::move(keys), values);
+}
+
+const Value* Dictionary::find(std::string_view key) const noexcept
+{
+    const auto position = object_ ? object_->shape()->positionOf(key) : std::nullopt;
+    return position ? &values()[*position] : nullptr;
 }
 
 Dictionary Dictionary::with(String key, Value value) const
 {
-    const auto place = std::ranges::find(entries(), key, &Entry::key);
-    Entries changed;
+    std::vector<Value> changed;
     changed.reserve(size() + 1);
-    changed.assign(begin(), end());
-    if (place == end())
-        changed.push_back({std::move(key), std::move(value)});
-    else
-        changed[static_cast<std::size_t>(place - begin())].value = std::move(value);
-    return changed;
+    changed.assign(values().begin(), values().end());
+    if (const auto position = object_ ? object_->shape()->positionOf(key) : std::nullopt) {
+        changed[*position] = std::move(value);
+        return {object_->shape(), changed};
+    }
+    changed.push_back(std::move(value));
+    std::vector<String> longer;
+    longer.reserve(changed.size());
+    longer.assign(keys().begin(), keys().end());
+    longer.push_back(std::move(key));
+    return {DictionaryShape::make(std::move(longer)), changed};
 }
 
 Dictionary Dictionary::without(std::string_view key) const
@@ -289,27 +269,32 @@ Dictionary Dictionary::mergedWith(const Dictionary& other) const
 }
 
 // As long as both have the same keys in the same places, only what differs is asked whether it counts.
-bool Dictionary::isEqualIgnoring(const Dictionary& other, std::span<const std::string_view> keys) const noexcept
+bool Dictionary::isEqualIgnoring(const Dictionary& other, std::span<const std::string_view> ignored) const noexcept
 {
-    const auto counts = [keys](const Entry& entry) { return std::ranges::find(keys, entry.key.view()) == keys.end(); };
-    auto ours = entries();
-    auto theirs = other.entries();
-    while (!ours.empty() && !theirs.empty() && ours.front().key == theirs.front().key) {
-        if (ours.front().value != theirs.front().value && counts(ours.front()))
+    const auto counts = [ignored](const String& key) {
+        return std::ranges::find(ignored, key.view()) == ignored.end();
+    };
+    const auto ours = keys();
+    const auto theirs = other.keys();
+    const bool areSameKeys = ours.data() == theirs.data();
+    std::size_t position = 0;
+    for (; position < std::min(ours.size(), theirs.size()); ++position) {
+        if (!areSameKeys && ours[position] != theirs[position])
+            break;
+        if (values()[position] != other.values()[position] && counts(ours[position]))
             return false;
-        ours = ours.subspan(1);
-        theirs = theirs.subspan(1);
     }
-    std::size_t counted = 0;
-    for (const Entry& entry : ours) {
-        if (!counts(entry))
+    const auto countOfOthers = std::ranges::count_if(theirs.subspan(position), counts);
+    std::ptrdiff_t counted = 0;
+    for (; position < ours.size(); ++position) {
+        if (!counts(ours[position]))
             continue;
         ++counted;
-        const Value* const value = other.find(entry.key);
-        if (value == nullptr || *value != entry.value)
+        const Value* const value = other.find(ours[position]);
+        if (value == nullptr || *value != values()[position])
             return false;
     }
-    return counted == static_cast<std::size_t>(std::ranges::count_if(theirs, counts));
+    return counted == countOfOthers;
 }
 
 } // namespace foundation

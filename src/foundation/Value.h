@@ -5,10 +5,12 @@
 // makes it safe to hand a payload to the store's thread while the session keeps it too.
 #pragma once
 
+#include "foundation/DictionaryShape.h"
 #include "foundation/Number.h"
 #include "foundation/Reference.h"
 #include "foundation/String.h"
 
+#include <cstddef>
 #include <cstdint>
 #include <initializer_list>
 #include <optional>
@@ -138,24 +140,36 @@ private:
     };
 };
 
+// A shared object with values right behind it, in one allocation.
 class ArrayObject : public ReferenceCounted {
 public:
-    explicit ArrayObject(std::vector<Value> given) noexcept : values(std::move(given)) { }
-    static void destroy(const ArrayObject* object) noexcept { delete object; }
+    // Moves the values; null pointer when there are none.
+    static const ArrayObject* create(std::span<Value> values);
+    static void destroy(const ArrayObject* object) noexcept;
 
-    const std::vector<Value> values;
+    [[nodiscard]] std::span<const Value> values() const noexcept
+    {
+        return {reinterpret_cast<const Value*>(this + 1), size_};
+    }
+
+private:
+    explicit ArrayObject(std::size_t size) noexcept : size_(size) { }
+
+    std::size_t size_;
 };
 
 // An immutable, shared list of values. Any thread.
 class Array {
 public:
     Array() noexcept = default;
-    Array(std::vector<Value> values);
+    // Moves the values.
+    explicit Array(std::span<Value> values) : object_(Reference<ArrayObject>::adopt(ArrayObject::create(values))) { }
+    Array(std::vector<Value> values) : Array(std::span(values)) { }
     Array(std::initializer_list<Value> values) : Array(std::vector<Value>(values)) { }
 
     [[nodiscard]] std::span<const Value> values() const noexcept
     {
-        return object_ ? std::span<const Value>(object_->values) : std::span<const Value>();
+        return object_ ? object_->values() : std::span<const Value>();
     }
     [[nodiscard]] std::size_t size() const noexcept { return values().size(); }
     [[nodiscard]] bool empty() const noexcept { return values().empty(); }
@@ -171,60 +185,82 @@ private:
     Reference<ArrayObject> object_;
 };
 
-// One entry of a dictionary.
+// One entry of a dictionary that is being made.
 struct DictionaryEntry {
     String key;
     Value value;
 };
 
-// Entries in order of insertion and, where they are many, their positions in the order of their keys. A
-// sorted index rather than a hash table: no choice of keys, however hostile, makes it slow.
+// What a dictionary shares: a shape, and values right behind the object, in one allocation.
 class DictionaryObject : public ReferenceCounted {
 public:
-    explicit DictionaryObject(std::vector<DictionaryEntry> given);
-    static void destroy(const DictionaryObject* object) noexcept { delete object; }
+    // Moves the values, as many as the shape has keys; null pointer when there are none.
+    static const DictionaryObject* create(Reference<DictionaryShape> shape, std::span<Value> values);
+    static void destroy(const DictionaryObject* object) noexcept;
 
-    [[nodiscard]] std::span<const DictionaryEntry> entries() const noexcept { return entries_; }
-    [[nodiscard]] const Value* find(std::string_view key) const noexcept;
+    [[nodiscard]] const Reference<DictionaryShape>& shape() const noexcept { return shape_; }
+    [[nodiscard]] std::span<const String> keys() const noexcept { return shape_->keys(); }
+    [[nodiscard]] std::span<const Value> values() const noexcept
+    {
+        return {reinterpret_cast<const Value*>(this + 1), keys().size()};
+    }
 
 private:
-    [[nodiscard]] std::string_view keyAt(std::uint32_t position) const noexcept { return entries_[position].key; }
-    void foldRepetitions();
-    void indexAndFoldRepetitions();
-    void indexKeys();
+    explicit DictionaryObject(Reference<DictionaryShape> shape) noexcept : shape_(std::move(shape)) { }
 
-    std::vector<DictionaryEntry> entries_;
-    std::vector<std::uint32_t> byKey_; // empty where there are few entries
+    Reference<DictionaryShape> shape_;
 };
 
 // An immutable, shared dictionary in the order of insertion. Any thread.
 //
-// There is one way to make one: from a list of entries, in which an entry whose key stands earlier
-// replaces that entry's value and takes its place. Changing is making a new one; whoever gathers many entries
-// gathers them in a vector.
+// One is made from a list of entries, in which an entry whose key stands earlier replaces that entry's value and takes
+// its place. Changing is making a new one; whoever gathers many entries gathers them in a vector.
 class Dictionary {
 public:
-    using Entry = DictionaryEntry;
-    using Entries = std::vector<Entry>;
+    using Entries = std::vector<DictionaryEntry>;
+
+    // An entry, for whoever goes over a dictionary.
+    struct Entry {
+        const String& key;
+        const Value& value;
+        operator DictionaryEntry() const { return {key, value}; }
+    };
+    class Iterator;
+    using value_type = Entry;
+    using const_iterator = Iterator;
 
     Dictionary() noexcept = default;
     Dictionary(Entries entries);
-    Dictionary(std::initializer_list<Entry> entries) : Dictionary(Entries(entries)) { }
-
-    [[nodiscard]] std::span<const Entry> entries() const noexcept
+    Dictionary(std::initializer_list<DictionaryEntry> entries) : Dictionary(Entries(entries)) { }
+    // Of keys, which may repeat, and as many values, which are moved.
+    Dictionary(std::vector<String> keys, std::span<Value> values);
+    // Of a shape, and a value for each of its keys; they are moved.
+    Dictionary(Reference<DictionaryShape> shape, std::span<Value> values)
+        : object_(Reference<DictionaryObject>::adopt(DictionaryObject::create(std::move(shape), values)))
     {
-        return object_ ? object_->entries() : std::span<const Entry>();
     }
-    [[nodiscard]] std::size_t size() const noexcept { return entries().size(); }
-    [[nodiscard]] bool empty() const noexcept { return entries().empty(); }
-    [[nodiscard]] auto begin() const noexcept { return entries().begin(); }
-    [[nodiscard]] auto end() const noexcept { return entries().end(); }
+
+    // Of all dictionaries but the empty one, which has none.
+    [[nodiscard]] Reference<DictionaryShape> shape() const noexcept
+    {
+        return object_ ? object_->shape() : Reference<DictionaryShape>();
+    }
+    [[nodiscard]] std::span<const String> keys() const noexcept
+    {
+        return object_ ? object_->keys() : std::span<const String>();
+    }
+    // In the order of the keys.
+    [[nodiscard]] std::span<const Value> values() const noexcept
+    {
+        return object_ ? object_->values() : std::span<const Value>();
+    }
+    [[nodiscard]] std::size_t size() const noexcept { return keys().size(); }
+    [[nodiscard]] bool empty() const noexcept { return object_.get() == nullptr; }
+    [[nodiscard]] Iterator begin() const noexcept;
+    [[nodiscard]] Iterator end() const noexcept;
 
     // The value under the key, or null pointer. Valid as long as a copy of this dictionary lives.
-    [[nodiscard]] const Value* find(std::string_view key) const noexcept
-    {
-        return object_ ? object_->find(key) : nullptr;
-    }
+    [[nodiscard]] const Value* find(std::string_view key) const noexcept;
     [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
 
     // Copies with one entry set, with one entry removed, and with all entries of another set.
@@ -254,6 +290,44 @@ private:
     explicit Dictionary(Reference<DictionaryObject> object) noexcept : object_(std::move(object)) { }
     Reference<DictionaryObject> object_;
 };
+
+class Dictionary::Iterator {
+public:
+    using value_type = Entry;
+    using difference_type = std::ptrdiff_t;
+
+    Iterator() noexcept = default;
+    Iterator(const String* key, const Value* value) noexcept : key_(key), value_(value) { }
+
+    Entry operator*() const noexcept { return {*key_, *value_}; }
+    struct Pointer {
+        Entry entry;
+        const Entry* operator->() const noexcept { return &entry; }
+    };
+    Pointer operator->() const noexcept { return {**this}; }
+    Iterator& operator++() noexcept
+    {
+        ++key_;
+        ++value_;
+        return *this;
+    }
+    Iterator operator++(int) noexcept { return {key_++, value_++}; }
+    friend bool operator==(const Iterator& left, const Iterator& right) noexcept { return left.key_ == right.key_; }
+
+private:
+    const String* key_ = nullptr;
+    const Value* value_ = nullptr;
+};
+
+inline Dictionary::Iterator Dictionary::begin() const noexcept
+{
+    return {keys().data(), values().data()};
+}
+
+inline Dictionary::Iterator Dictionary::end() const noexcept
+{
+    return {keys().data() + size(), values().data() + size()};
+}
 
 // --- What is as short as that is to cost no call.
 

@@ -24,11 +24,11 @@ public:
     struct Violation {
         std::string reason;
     };
-    // One call. Whoever works on it keeps `credit` until it is answered: while a client's unanswered calls
-    // are too many or too large, the connection reads no more from it.
+    // One call, and the connection that it came from. Whoever works on it keeps `caller` until it is answered: while
+    // a client's unanswered calls are too many or too large, the connection reads no more from it.
     struct Call {
         foundation::Array frame;
-        std::shared_ptr<void> credit;
+        std::shared_ptr<Connection> caller;
     };
     using CallHandler = std::move_only_function<std::expected<void, Violation>(Call call)>;
     using EndHandler = std::move_only_function<void()>;

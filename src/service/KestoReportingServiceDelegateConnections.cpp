@@ -23,8 +23,9 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
         const auto client = std::make_shared<Client>(processIdentifier, weak_from_this());
         weakClient = client;
         connection->setCallHandler(
-            [adapter = KestoReportingServiceProtocolAdapter(client, connection)](
-                platform::Connection::Call call) mutable { return adapter.handleCall(std::move(call)); });
+            [adapter = KestoReportingServiceProtocolAdapter(client)](platform::Connection::Call call) mutable {
+                return adapter.handleCall(std::move(call));
+            });
     }
     KestoReportingServerQueue()->submit([self = shared_from_this(), weakClient] {
         if (const auto client = weakClient.lock())

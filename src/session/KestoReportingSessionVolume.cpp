@@ -194,7 +194,7 @@ private:
             return Value(*KestoReportingUtilityBucketNumberToString(number, buckets, places));
         };
         const auto fromState = [this](Key key) {
-            return Dictionary::Entry{KestoReportingVolumeKeyName(key), stateValue(key)};
+            return foundation::DictionaryEntry{KestoReportingVolumeKeyName(key), stateValue(key)};
         };
         return {fromState(Key::SelectedFormat),
                 fromState(Key::ActiveDevices),

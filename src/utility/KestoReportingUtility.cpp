@@ -5,9 +5,14 @@
 #include "platform/Platform.h"
 
 #include <algorithm>
+#include <array>
 #include <atomic>
 #include <chrono>
 #include <cmath>
+#include <cstddef>
+#include <functional>
+#include <iterator>
+#include <vector>
 
 namespace {
 
@@ -139,26 +144,75 @@ foundation::Dictionary KestoReportingUtilityRemoveEventEpochTime(const foundatio
 
 foundation::Dictionary KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message)
 {
-    if (std::ranges::none_of(message, hasBlank, &foundation::DictionaryEntry::key))
+    if (std::ranges::none_of(message.keys(), hasBlank))
         return message;
-    foundation::Dictionary::Entries entries;
-    entries.reserve(message.size());
-    for (const auto& [key, value] : message)
-        entries.push_back({withoutBlanks(key), value});
-    return entries;
+    std::vector<foundation::String> keys;
+    keys.reserve(message.size());
+    std::ranges::transform(message.keys(), std::back_inserter(keys), withoutBlanks);
+    std::vector<foundation::Value> values(message.values().begin(), message.values().end());
+    return {std::move(keys), values};
 }
+
+namespace {
+
+// What becomes of the messages of one shape when they are normalised: which of their values stay, and the shape that
+// these have then with the tag behind them.
+struct NormalisedShape {
+    foundation::Reference<foundation::DictionaryShape> of;
+    bool keepsTime = false;
+    std::vector<std::size_t> kept;
+    foundation::Reference<foundation::DictionaryShape> shape;
+};
+
+// A thread remembers the last ones: those of a session are nearly always of a shape that was there before.
+NormalisedShape& rememberedShape(const foundation::DictionaryShape* of)
+{
+    constexpr std::size_t remembered = 16;
+    thread_local std::array<NormalisedShape, remembered> recent;
+    return recent[std::hash<const void*>()(of) / alignof(std::max_align_t) % remembered];
+}
+
+foundation::Dictionary normaliseAnew(const foundation::Dictionary& message, const foundation::DictionaryEntry& tag,
+                                     NormalisedShape& result)
+{
+    std::vector<foundation::String> keys;
+    std::vector<foundation::Value> values;
+    result.kept.clear();
+    for (std::size_t position = 0; position < message.size(); ++position) {
+        auto key = withoutBlanks(message.keys()[position]);
+        if (!result.keepsTime && key == KestoReportingTimestampKey)
+            continue;
+        result.kept.push_back(position);
+        keys.push_back(std::move(key));
+        values.push_back(message.values()[position]);
+    }
+    keys.push_back(tag.key);
+    values.push_back(tag.value);
+    foundation::Dictionary normalised(std::move(keys), values);
+    const bool isSimple = normalised.size() == values.size() && normalised.shape()->isSmall();
+    result.shape = isSimple ? normalised.shape() : foundation::Reference<foundation::DictionaryShape>();
+    result.of = isSimple ? message.shape() : foundation::Reference<foundation::DictionaryShape>();
+    return normalised;
+}
+
+} // namespace
 
 foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::Dictionary& message,
                                                              AudioEventCategory category, AudioEventType type)
 {
     const bool keepsTime = KestoReportingUtilityIsInternalBuild();
-    foundation::Dictionary::Entries entries;
-    entries.reserve(message.size() + 1);
-    for (const auto& [key, value] : message)
-        if (auto name = withoutBlanks(key); keepsTime || name != KestoReportingTimestampKey)
-            entries.push_back({std::move(name), value});
-    entries.push_back(audioMessageTag(category, type));
-    return entries;
+    const auto tag = audioMessageTag(category, type);
+    NormalisedShape& known = rememberedShape(message.shape().get());
+    if (!known.shape || known.of.get() != message.shape().get() || known.keepsTime != keepsTime) {
+        known.keepsTime = keepsTime;
+        return normaliseAnew(message, tag, known);
+    }
+    std::vector<foundation::Value> values;
+    values.reserve(known.kept.size() + 1);
+    for (const std::size_t position : known.kept)
+        values.push_back(message.values()[position]);
+    values.push_back(tag.value);
+    return {known.shape, values};
 }
 
 double KestoReportingUtilityRoundWithPlaces(double value, int places)

@@ -45,7 +45,7 @@ protected:
     // The reason why the call is refused, or nothing.
     std::optional<std::string> refusal(const Array& frame)
     {
-        const auto result = adapter.handleCall({frame, nullptr});
+        const auto result = adapter.handleCall({frame, connection});
         return result ? std::nullopt : std::optional(result.error().reason);
     }
     void accept(const Array& frame) { EXPECT_EQ(refusal(frame), std::nullopt); }
@@ -53,7 +53,7 @@ protected:
     // A strict mock: whatever is called unexpectedly is a failure.
     std::shared_ptr<StrictMock<MockProtocol>> protocol = std::make_shared<StrictMock<MockProtocol>>();
     std::shared_ptr<support::FakeConnection> connection = std::make_shared<support::FakeConnection>(7);
-    KestoReportingServiceProtocolAdapter adapter{protocol, connection};
+    KestoReportingServiceProtocolAdapter adapter{protocol};
 };
 
 // --- what a call means
@@ -332,37 +332,22 @@ TEST_F(AdapterTest, AnswersACallAsOftenAndAsLateAsItIsTold)
                 ElementsAre(Array{2, null, 65535}, Array{2, null, 4}, Array{1, null, true}, Array{1, null, true}));
 }
 
-TEST_F(AdapterTest, HoldsACallsCreditUntilNobodyCanAnswerItAnyMore)
-{
-    KestoReportingServiceProtocol::SuccessReply held;
-    EXPECT_CALL(*protocol, startReportingSessionForID).WillOnce([&](auto, auto reply) { held = std::move(reply); });
-    auto credit = std::make_shared<int>();
-    const std::weak_ptr<void> outstanding = credit;
-    ASSERT_TRUE(adapter.handleCall({{1, 5, 42}, std::move(credit)}));
-    held(std::nullopt, true);
-    EXPECT_FALSE(outstanding.expired());
-    held = nullptr;
-    EXPECT_TRUE(outstanding.expired());
-}
-
-TEST_F(AdapterTest, HoldsNoCreditOfACallThatItRefuses)
-{
-    auto credit = std::make_shared<int>();
-    const std::weak_ptr<void> outstanding = credit;
-    EXPECT_FALSE(adapter.handleCall({{1, 5, "x"}, std::move(credit)}));
-    EXPECT_TRUE(outstanding.expired());
-}
-
-TEST_F(AdapterTest, AnswersNobodyWhenTheConnectionIsGone)
+TEST_F(AdapterTest, HoldsACallersConnectionUntilNobodyCanAnswerItAnyMore)
 {
     KestoReportingServiceProtocol::SuccessReply held;
     EXPECT_CALL(*protocol, startReportingSessionForID).WillOnce([&](auto, auto reply) { held = std::move(reply); });
     accept({1, 5, 42});
-    const std::weak_ptr<Connection> gone = connection;
-    connection.reset();
-    EXPECT_TRUE(gone.expired()) << "an answer to come does not keep the connection";
+    EXPECT_EQ(connection.use_count(), 2);
     held(std::nullopt, true);
-    accept({2, 1, 42}); // and nothing is called for it either
+    EXPECT_EQ(connection.use_count(), 2);
+    held = nullptr;
+    EXPECT_EQ(connection.use_count(), 1);
+}
+
+TEST_F(AdapterTest, HoldsNoCallerOfACallThatItRefuses)
+{
+    EXPECT_TRUE(refusal({1, 5, "x"}));
+    EXPECT_EQ(connection.use_count(), 1);
 }
 
 } // namespace

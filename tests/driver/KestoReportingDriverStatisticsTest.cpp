@@ -267,9 +267,8 @@ protected:
         std::vector<std::string> messages;
         for (const Dictionary& message : session->nestedAggregatedPayloadData().value_or(std::vector<Dictionary>()))
             for (const auto& [identifier, payload] : message)
-                messages.push_back(
-                    std::string(identifier.view()) + ": "
-                    + payload.dictionary()->without("kestoreporting_timestamp").entries()[0].value.text());
+                messages.push_back(std::string(identifier.view()) + ": "
+                                   + payload.dictionary()->without("kestoreporting_timestamp").values()[0].text());
         return messages;
     }
     std::vector<std::string> errors()

@@ -130,8 +130,78 @@ TEST(Cbor, TheKeysOfLaterMessagesAreTheSameObjects)
     const std::string bytes = encoded(Dictionary{{"PomoSessionVolume", "PomoSessionVolume"}});
     const Dictionary first = *decoder.decode(bytes)->dictionary();
     const Dictionary second = *decoder.decode(bytes)->dictionary();
-    EXPECT_TRUE(first.entries()[0].key.isSameObject(second.entries()[0].key));
-    EXPECT_FALSE(first.entries()[0].value.string()->isSameObject(second.entries()[0].key)) << "values are not keys";
+    EXPECT_TRUE(first.keys()[0].isSameObject(second.keys()[0]));
+    EXPECT_FALSE(first.values()[0].string()->isSameObject(second.keys()[0])) << "values are not keys";
+}
+
+TEST(Cbor, LaterMessagesOfTheSameKeysHaveTheSameShape)
+{
+    CborDecoder decoder;
+    const auto shapeOf = [&decoder](std::string_view hex) {
+        return decoder.decode(fromHex(hex))->dictionary()->shape();
+    };
+    const auto definite = shapeOf("a2616101616202");
+    const auto indefinite = shapeOf("bf616101616202ff");
+    EXPECT_EQ(shapeOf("a26161f661626178").get(), definite.get());
+    EXPECT_EQ(shapeOf("bf6161f661626178ff").get(), indefinite.get());
+    EXPECT_NE(shapeOf("a2616201616102").get(), definite.get());
+    EXPECT_EQ(shapeOf("a2616101616202").get(), definite.get()) << "one that begins otherwise has another place";
+    EXPECT_NE(shapeOf("a2616101616302").get(), definite.get());
+    EXPECT_NE(shapeOf("a2616101616202").get(), definite.get()) << "one that begins like it took its place";
+}
+
+TEST(Cbor, MapsInsideMapsHaveTheirShapesToo)
+{
+    CborDecoder decoder;
+    const std::string bytes = encoded(Dictionary{{"a", Dictionary{{"a", Dictionary{{"b", 1}}}}}, {"c", 2}});
+    const Dictionary first = *decoder.decode(bytes)->dictionary();
+    const Dictionary second = *decoder.decode(bytes)->dictionary();
+    EXPECT_EQ(first, second);
+    EXPECT_EQ(first.shape().get(), second.shape().get());
+    EXPECT_EQ(first.find("a")->dictionary()->shape().get(), second.find("a")->dictionary()->shape().get());
+}
+
+TEST(Cbor, MoreOrFewerKeysThanBeforeAreReadRight)
+{
+    CborDecoder decoder;
+    for (const std::string_view hex : {"bf616101616202616303ff", "bf616101616202ff", "bf616101616202616303616404ff",
+                                       "bf616101ff", "bf616101616201616103ff", "bfff", "bf616101616202616303ff"})
+        EXPECT_EQ(encoded(*decoder.decode(fromHex(hex))), encoded(*CborDecoder().decode(fromHex(hex)))) << hex;
+}
+
+TEST(Cbor, LargeShapesAreNotRemembered)
+{
+    CborDecoder decoder;
+    Dictionary::Entries many;
+    for (int number = 0; number < 33; ++number)
+        many.push_back({String("key" + std::to_string(number)), number});
+    const Dictionary withALongKey{{String(std::string(65, 'k')), 1}};
+    for (const Dictionary& dictionary : {withALongKey, Dictionary(many)}) {
+        const Dictionary first = *decoder.decode(encoded(dictionary))->dictionary();
+        const Dictionary second = *decoder.decode(encoded(dictionary))->dictionary();
+        EXPECT_EQ(first, second);
+        EXPECT_NE(first.shape().get(), second.shape().get());
+    }
+}
+
+// What a decoder remembers makes it faster, and changes nothing.
+RC_GTEST_PROP(CborProperty, OneDecoderReadsWhatAFreshOneDoesEachTime, ())
+{
+    CborDecoder decoder;
+    for (const Value& value : *rc::gen::container<std::vector<Value>>(generated::value())) {
+        std::string bytes = encoded(value);
+        if (*rc::gen::arbitrary<bool>())
+            bytes[*rc::gen::inRange<std::size_t>(0, bytes.size())] = *rc::gen::arbitrary<char>();
+        for (int round = 0; round < 2; ++round) {
+            const auto fresh = CborDecoder().decode(bytes);
+            const auto read = decoder.decode(bytes);
+            RC_ASSERT(read.has_value() == fresh.has_value());
+            if (read)
+                RC_ASSERT(encoded(*read) == encoded(*fresh));
+            else
+                RC_ASSERT(read.error() == fresh.error());
+        }
+    }
 }
 
 TEST(Cbor, ManyKeysAndLongOnesAreReadRightThoughNotRemembered)

@@ -44,6 +44,41 @@ TEST(Dictionary, AReplacedEntryKeepsItsPlace)
     EXPECT_EQ(dictionary.size(), 3U);
 }
 
+TEST(Dictionary, OneWithAnotherValueHasTheSameShape)
+{
+    const Dictionary dictionary{{"z", 1}, {"a", 2}};
+    const Dictionary changed = dictionary.with("a", 3);
+    EXPECT_EQ(changed.shape().get(), dictionary.shape().get());
+    EXPECT_EQ(changed, (Dictionary{{"z", 1}, {"a", 3}}));
+    EXPECT_EQ(dictionary, (Dictionary{{"z", 1}, {"a", 2}}));
+    const Dictionary longer = dictionary.with("b", 3);
+    EXPECT_THAT(keysOf(longer), ElementsAre("z", "a", "b"));
+    EXPECT_EQ(Dictionary().with("b", 3), (Dictionary{{"b", 3}}));
+}
+
+TEST(Dictionary, TheEmptyOneHasNoShape)
+{
+    EXPECT_EQ(Dictionary().shape().get(), nullptr);
+    EXPECT_EQ(Dictionary(Dictionary::Entries()).shape().get(), nullptr);
+    EXPECT_EQ(Dictionary{}.begin(), Dictionary{}.end());
+}
+
+TEST(Dictionary, OneOfAShapeHasItsKeysAndTheGivenValues)
+{
+    const Dictionary dictionary{{"z", 1}, {"a", 2}};
+    std::vector<Value> values{"first", Array{2}};
+    EXPECT_EQ(Dictionary(dictionary.shape(), values), (Dictionary{{"z", "first"}, {"a", Array{2}}}));
+}
+
+TEST(DictionaryShape, IsSmallUpToThirtyTwoShortKeys)
+{
+    const auto shapeOf = [](int count) { return numbered(count).shape(); };
+    EXPECT_TRUE(shapeOf(32)->isSmall());
+    EXPECT_FALSE(shapeOf(33)->isSmall());
+    EXPECT_TRUE((Dictionary{{String(std::string(64, 'k')), 1}}.shape()->isSmall()));
+    EXPECT_FALSE((Dictionary{{String(std::string(65, 'k')), 1}}.shape()->isSmall()));
+}
+
 TEST(Dictionary, FindsAmongTenAndAmongTenThousand)
 {
     for (const int count : {0, 1, 10, 16, 17, 10'000}) {
@@ -66,7 +101,7 @@ Dictionary::Entries naivelyFolded(const Dictionary::Entries& entries)
 {
     Dictionary::Entries folded;
     for (const auto& entry : entries) {
-        const auto earlier = std::ranges::find(folded, entry.key, &Dictionary::Entry::key);
+        const auto earlier = std::ranges::find(folded, entry.key, &DictionaryEntry::key);
         if (earlier == folded.end())
             folded.push_back(entry);
         else
@@ -77,7 +112,7 @@ Dictionary::Entries naivelyFolded(const Dictionary::Entries& entries)
 
 bool sameEntries(const Dictionary& dictionary, const Dictionary::Entries& entries)
 {
-    return std::ranges::equal(dictionary.entries(), entries, [](const auto& left, const auto& right) {
+    return std::ranges::equal(dictionary, entries, [](const auto& left, const auto& right) {
         return left.key == right.key && left.value == right.value;
     });
 }

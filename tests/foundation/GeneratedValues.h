@@ -72,9 +72,9 @@ inline rc::Gen<foundation::Value> scalar()
 
 inline rc::Gen<foundation::Value> value(int depth = 3);
 
-inline rc::Gen<foundation::Dictionary::Entry> entry(int depth)
+inline rc::Gen<foundation::DictionaryEntry> entry(int depth)
 {
-    return rc::gen::construct<foundation::Dictionary::Entry>(key(), value(depth));
+    return rc::gen::construct<foundation::DictionaryEntry>(key(), value(depth));
 }
 
 inline rc::Gen<foundation::Dictionary::Entries> entries(int depth = 2)

@@ -286,7 +286,7 @@ TEST(ServiceDriverStatistics, AreTakenAndReportedByItsSampler)
     onQueue([&] { harness.service->sendDriverLogsForSession(session); });
     const auto messages = session->nestedAggregatedPayloadData().value();
     ASSERT_THAT(messages, SizeIs(1));
-    const Dictionary told = *messages[0].entries()[0].value.dictionary();
+    const Dictionary told = *messages[0].values()[0].dictionary();
     ASSERT_TRUE(told.contains("codec_Speaker_DMA_Simple_underruns")) << Value(told).text();
     EXPECT_EQ(*told.find("codec_Speaker_DMA_Simple_underruns"), Value(5));
 }

@@ -212,7 +212,7 @@ TEST_F(FeaturesTest, AreReadAtTheirChangeAndNotRemembered)
     const auto messages = player.session(42)->nestedAggregatedPayloadData().value();
     std::vector<std::string> told;
     for (const auto& message : messages)
-        told.push_back(message.entries()[0].value.dictionary()->find("ringerstate")->text());
+        told.push_back(message.values()[0].dictionary()->find("ringerstate")->text());
     EXPECT_THAT(told, ElementsAre("1", "0")) << "the second says nothing new, whatever its time";
 }
 

@@ -51,7 +51,7 @@ protected:
     {
         std::vector<std::string> identifiers;
         for (const auto& message : recorded())
-            identifiers.emplace_back(message.entries().front().key.view());
+            identifiers.emplace_back(message.keys().front().view());
         return identifiers;
     }
 

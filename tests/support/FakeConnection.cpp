@@ -15,10 +15,10 @@ std::expected<void, platform::Connection::Violation> FakeConnection::call(Array 
     EXPECT_TRUE(isResumed_ && !isOver_) << "no call reaches a service that does not read";
     std::string bytes;
     foundation::appendCbor(Value(std::move(frame)), bytes);
-    const auto credit = std::make_shared<char>();
-    credits_.push_back(credit);
+    const auto unanswered = std::make_shared<std::shared_ptr<Connection>>(shared_from_this());
+    unanswered_.push_back(unanswered);
     const CallScope scope(*this);
-    auto result = callHandler_({decoded(bytes), credit});
+    auto result = callHandler_({decoded(bytes), {unanswered, this}});
     if (!result)
         breakOff();
     return result;
@@ -33,7 +33,7 @@ void FakeConnection::resume()
 std::size_t FakeConnection::unansweredCalls() const
 {
     return static_cast<std::size_t>(
-        std::ranges::count_if(credits_, [](const auto& credit) { return !credit.expired(); }));
+        std::ranges::count_if(unanswered_, [](const auto& call) { return !call.expired(); }));
 }
 
 void FakeConnection::close()

@@ -15,7 +15,7 @@
 namespace support {
 
 // One thread.
-class FakeConnection final : public platform::Connection {
+class FakeConnection final : public platform::Connection, public std::enable_shared_from_this<FakeConnection> {
 public:
     explicit FakeConnection(std::int32_t processIdentifier) : processIdentifier_(processIdentifier) { }
 
@@ -55,7 +55,7 @@ private:
     bool isOver_ = false;
     foundation::CborDecoder decoder_;
     std::vector<foundation::Array> received_;
-    std::vector<std::weak_ptr<void>> credits_;
+    std::vector<std::weak_ptr<void>> unanswered_;
 };
 
 // Hands connections to its delegate when the test has them come.

@@ -40,7 +40,7 @@ public:
 
     bool EndArray(rapidjson::SizeType count)
     {
-        foundation::Array array({values_.end() - static_cast<std::ptrdiff_t>(count), values_.end()});
+        foundation::Array array(std::span<foundation::Value>(values_).last(count));
         values_.resize(values_.size() - count);
         return add(std::move(array));
     }

@@ -215,9 +215,28 @@ RC_GTEST_PROP(NormalisedMessage, IsWhatTheThreeStepsMakeOfIt, (bool isInternalBu
         entries.push_back({foundation::String(entryKey), value});
     const Dictionary message(entries);
 
-    const Dictionary expected = KestoReportingUtilityRemoveEventEpochTime(
-        KestoReportingUtilityAddAudioMessageTag(KestoReportingUtilityRemoveWhiteSpaceFromKeys(message), 4, 1));
-    RC_ASSERT(Value(KestoReportingUtilityNormaliseMessage(message, 4, 1)).text() == Value(expected).text());
+    const auto isRight = [](const Dictionary& given, AudioEventType type) {
+        const Dictionary expected = KestoReportingUtilityRemoveEventEpochTime(
+            KestoReportingUtilityAddAudioMessageTag(KestoReportingUtilityRemoveWhiteSpaceFromKeys(given), 4, type));
+        return Value(KestoReportingUtilityNormaliseMessage(given, 4, type)).text() == Value(expected).text();
+    };
+    RC_ASSERT(isRight(message, 1));
+    std::vector<Value> others(message.size(), "other");
+    const Dictionary later = message.empty() ? message : Dictionary(message.shape(), others);
+    RC_ASSERT(isRight(later, 2)); // of a shape that is known now
+    platform.deviceProperties.setInternalBuild(!isInternalBuild);
+    RC_ASSERT(isRight(later, 2));
+}
+
+TEST(NormaliseMessage, MessagesOfOneShapeGetOneShape)
+{
+    const support::TestPlatform platform;
+    const Dictionary first{{"a b", 1}, {"c", 2}};
+    const Dictionary second = first.with("c", 3);
+    EXPECT_EQ(first.shape().get(), second.shape().get());
+    const Dictionary normalised = KestoReportingUtilityNormaliseMessage(first, 4, 1);
+    EXPECT_EQ(normalised.shape().get(), KestoReportingUtilityNormaliseMessage(second, 4, 1).shape().get());
+    EXPECT_EQ(normalised.shape().get(), KestoReportingUtilityNormaliseMessage(second, 4, 2).shape().get());
 }
 
 // --- numbers

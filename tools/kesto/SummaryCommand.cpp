@@ -81,7 +81,7 @@ private:
         const auto entry = element.dictionary();
         if (!entry || entry->size() != 1)
             return false;
-        const auto& [identifier, value] = entry->entries().front();
+        const auto& [identifier, value] = *entry->begin();
         const auto payload = value.dictionary();
         std::optional<Timeline::Row> row;
         if (!payload || !timeline_.add(identifier, *payload, row))

@@ -56,7 +56,7 @@ std::vector<Statement> statementsOf(std::string_view toml)
         statement.text = text;
         const auto said = platform::parseToml(text);
         if (said && !said->empty()) {
-            statement.key = std::string(said->entries().front().key.view());
+            statement.key = std::string(said->keys().front().view());
             statement.isTable = firstCharacter(text) == '[';
             if (statement.isTable)
                 table = statement.key;

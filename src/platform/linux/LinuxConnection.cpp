@@ -195,7 +195,8 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
         }
         const std::size_t size = (*frame)->size();
         unanswered_.fetch_add(unansweredCall(size));
-        hub_->calls.push_back({*std::move(array), std::make_shared<Credit>(shared_from_this(), size)});
+        std::shared_ptr<Connection> caller(std::make_shared<Credit>(shared_from_this(), size), this);
+        hub_->calls.push_back({*std::move(array), std::move(caller)});
     }
 }
 
@@ -263,7 +264,7 @@ void LinuxConnection::send(std::string frame)
     else if (unsent > mostUnsentBytes)
         breakOff("it does not read its answers");
     else if (SerialQueue::isTurnRunning())
-        return Outbox::gather(shared_from_this(), frame);
+        return Outbox::gather(*this, frame);
     else {
         std::string frames;
         appendFrame(frame, frames);

@@ -39,10 +39,10 @@ Letters merged(Letters letters)
 
 } // namespace
 
-void Outbox::gather(std::shared_ptr<LinuxConnection> connection, std::string_view frame)
+void Outbox::gather(LinuxConnection& connection, std::string_view frame)
 {
-    if (gathered.empty() || gathered.back().connection != connection)
-        gathered.push_back({std::move(connection), {}});
+    if (gathered.empty() || gathered.back().connection.get() != &connection)
+        gathered.push_back({connection.shared_from_this(), {}});
     appendFrame(frame, gathered.back().frames);
 }
 

@@ -17,7 +17,7 @@ class LinuxConnection;
 class Outbox {
 public:
     // Adds a frame to those of the turn that the calling thread runs.
-    static void gather(std::shared_ptr<LinuxConnection> connection, std::string_view frame);
+    static void gather(LinuxConnection& connection, std::string_view frame);
 
     // Ends the turn that the calling thread ran. What is returned sends all that was gathered, from whichever
     // thread calls it; those of several turns must be called one after the other, in the order of the

@@ -22,7 +22,7 @@ public:
     void add(WorkItem item)
     {
         const bool mayHelp = isInteractive_ && thisThread.mayHelp(this);
-        if (mayHelp)
+        if (mayHelp && thisThread.toHelp == nullptr)
             thisThread.toHelp = shared_from_this();
         const foundation::Lock lock(lock_);
         waiting_.push_back(std::move(item));

@@ -1,29 +1,56 @@
-// Names repeat, patterns rarely change: answers are kept until they do, and all thrown away when there are too many,
-// which costs less than knowing which was used last.
+// Names repeat and patterns rarely change: each thread remembers what it was told, and under which patterns.
 #include "platform/linux/UsedEventNames.h"
 
 #include "platform/linux/AnalyticsConfiguration.h"
 
+#include <array>
+#include <cstdint>
+#include <functional>
+
 namespace platform {
+namespace {
+
+struct Answer {
+    std::uint64_t version = 0;
+    std::string name;
+    bool isUsed = false;
+};
+
+// Where the answer about a name is, if it was not driven away by another name.
+Answer& rememberedAnswer(std::string_view name)
+{
+    thread_local std::array<Answer, UsedEventNames::answersRemembered> answers;
+    return answers[std::hash<std::string_view>()(name) % answers.size()];
+}
+
+// One that was never there before, in this process.
+std::uint64_t newVersion()
+{
+    static std::atomic<std::uint64_t> last = 0;
+    return ++last;
+}
+
+} // namespace
+
+UsedEventNames::UsedEventNames() : version_(newVersion()) { }
 
 void UsedEventNames::setPatterns(std::vector<std::string> patterns)
 {
     const foundation::Lock lock(lock_);
     patterns_ = std::move(patterns);
-    answers_.clear();
+    version_ = newVersion();
 }
 
 bool UsedEventNames::contains(std::string_view name)
 {
-    const foundation::Lock lock(lock_);
-    if (const auto known = answers_.find(name); known != answers_.end())
-        return known->second;
-    if (answers_.size() >= mostAnswersKept)
-        answers_.clear();
-    std::string key(name);
-    const bool isUsed = matchesAny(patterns_, key);
-    answers_.emplace(std::move(key), isUsed);
-    return isUsed;
+    Answer& answer = rememberedAnswer(name);
+    if (answer.version != version_ || answer.name != name) {
+        std::string copy(name);
+        const foundation::Lock lock(lock_);
+        const bool isUsed = matchesAny(patterns_, copy);
+        answer = {version_, std::move(copy), isUsed};
+    }
+    return answer.isUsed;
 }
 
 } // namespace platform

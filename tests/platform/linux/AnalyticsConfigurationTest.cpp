@@ -138,12 +138,23 @@ TEST(UsedEventNamesTest, NewPatternsCountForNamesThatWereAskedForBefore)
     EXPECT_TRUE(names.contains("b.x"));
 }
 
-TEST(UsedEventNamesTest, MoreNamesThanAreKeptStillGetTheRightAnswer)
+TEST(UsedEventNamesTest, WhatOneWasToldDoesNotCountForAnother)
+{
+    UsedEventNames first;
+    UsedEventNames second;
+    first.setPatterns({"a.*"});
+    for (int round = 0; round < 2; ++round) {
+        EXPECT_TRUE(first.contains("a.x"));
+        EXPECT_FALSE(second.contains("a.x"));
+    }
+}
+
+TEST(UsedEventNamesTest, MoreNamesThanAreRememberedStillGetTheRightAnswer)
 {
     UsedEventNames names;
     names.setPatterns({"*7"});
     for (std::size_t round = 0; round < 2; ++round)
-        for (std::size_t number = 0; number < UsedEventNames::mostAnswersKept + 100; ++number)
+        for (std::size_t number = 0; number < 2 * UsedEventNames::answersRemembered; ++number)
             ASSERT_EQ(names.contains("name" + std::to_string(number)), number % 10 == 7);
 }
 

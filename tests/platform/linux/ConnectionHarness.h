@@ -176,7 +176,7 @@ inline constinit platform::LogCategory connectionTestCategory{"com.quarn.kesto",
 // Keeps everything that happens on a connection, in order.
 struct ConnectionRecord {
     std::shared_ptr<platform::Connection> connection;
-    std::vector<platform::Connection::Call> calls; // unless the test handles them; their credit is kept too
+    std::vector<platform::Connection::Call> calls; // unless the test handles them; with who made them
     std::vector<std::string> history; // "call 1", "interrupted", "invalidated"
     std::vector<std::thread::id> threads; // of the history
 };

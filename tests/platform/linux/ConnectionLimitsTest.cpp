@@ -215,7 +215,7 @@ TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
     std::atomic<std::uint64_t> answered = 0;
     handler = [&](ConnectionRecord&, Connection::Call& call) -> std::expected<void, Connection::Violation> {
         if (held.size() < starts)
-            held.push_back(std::move(call.credit));
+            held.push_back(std::move(call.caller));
         else
             ++answered;
         return {};
@@ -249,7 +249,7 @@ TEST_F(ConnectionLimits, CreditGivenBackFromManyThreadsIsAllThere)
     std::atomic<std::uint64_t> delivered = 0;
     handler = [&](ConnectionRecord&, Connection::Call& call) -> std::expected<void, Connection::Violation> {
         const std::scoped_lock lock(mutex);
-        held.push_back(std::move(call.credit));
+        held.push_back(std::move(call.caller));
         ++delivered;
         return {};
     };

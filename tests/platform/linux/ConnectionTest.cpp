@@ -176,7 +176,7 @@ TEST_F(Connections, MayOutliveTheirListener)
     stop();
     listener.reset();
     record.connection->send(answerTo(record.calls[0].frame));
-    record.calls.clear(); // gives the credit back
+    record.calls.clear(); // which lets the caller go
     EXPECT_EQ(client.readNumber(), std::nullopt);
 }
 

@@ -24,7 +24,7 @@ TEST(ParseJson, KeepsKindsAndOrder)
               Value(Dictionary{{"b", Array{true, Value(), -1, std::uint64_t(-1), 0.1, "ä\n"}},
                                {"a", Dictionary{{"x", Array{}}}}}));
     ASSERT_TRUE(value);
-    EXPECT_EQ(value->dictionary()->entries()[0].key.view(), "b");
+    EXPECT_EQ(value->dictionary()->keys()[0].view(), "b");
     EXPECT_EQ(parseJson("5"), Value(5));
 }
 
