@@ -47,9 +47,9 @@ private:
     };
 
     // A connection without a socket: it delivers the calls that it is told to.
-    class Connection final : public platform::Connection {
+    class Connection final : public platform::Connection, public std::enable_shared_from_this<Connection> {
     public:
-        void deliver(foundation::Array call) { (void)callHandler_({std::move(call), nullptr}); }
+        void deliver(foundation::Array call) { (void)callHandler_({std::move(call), shared_from_this()}); }
 
     private:
         [[nodiscard]] std::int32_t processIdentifier() const override { return 1; }

@@ -24,8 +24,8 @@ public:
     struct Violation {
         std::string reason;
     };
-    // One call, and the connection that it came from. Whoever works on it keeps `caller` until it is answered: while
-    // a client's unanswered calls are too many or too large, the connection reads no more from it.
+    // One call, and the connection that it came from, which is never null. Whoever works on it keeps `caller` until it
+    // is answered: while a client's unanswered calls are too many or too large, the connection reads no more from it.
     struct Call {
         foundation::Array frame;
         std::shared_ptr<Connection> caller;

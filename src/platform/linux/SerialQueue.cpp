@@ -178,12 +178,14 @@ SerialQueue::Helper::Helper()
 {
     assert(!Work::thisThread.isHelper);
     Work::thisThread.isHelper = true;
+    setQualityOfThisThread(QualityOfService::UserInteractive);
 }
 
 SerialQueue::Helper::~Helper()
 {
     help();
     Work::thisThread.isHelper = false;
+    setQualityOfThisThread(QualityOfService::Default);
 }
 
 void SerialQueue::Helper::help()

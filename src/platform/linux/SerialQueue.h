@@ -41,7 +41,8 @@ public:
     // Whether the calling thread runs a turn for whose end a handler waits.
     [[nodiscard]] static bool isTurnRunning() noexcept;
 
-    // The calling thread helps as long as this lives. One a thread.
+    // The calling thread helps as long as this lives, with the priority of an interactive queue: without it, a client
+    // that is woken by its answer takes the processor from whoever has not yet finished with it. One a thread.
     class Helper {
     public:
         Helper();

@@ -21,14 +21,15 @@ constexpr int niceness(QualityOfService quality) noexcept
     return 0;
 }
 
-// To Linux a thread is a process of its own when it comes to priorities, and a new one has its creator's.
-void applyToCurrentThread(QualityOfService quality)
+} // namespace
+
+// To Linux a thread is a process of its own when it comes to priorities; that of the first thread counts as the
+// process's, until it is given another here.
+void setQualityOfThisThread(QualityOfService quality)
 {
-    const int ofTheProcess = getpriority(PRIO_PROCESS, static_cast<id_t>(getpid()));
+    static const int ofTheProcess = getpriority(PRIO_PROCESS, static_cast<id_t>(getpid()));
     setpriority(PRIO_PROCESS, static_cast<id_t>(gettid()), ofTheProcess + niceness(quality));
 }
-
-} // namespace
 
 std::string threadName(std::string_view name)
 {
@@ -45,7 +46,7 @@ std::thread startThread(std::string_view name, QualityOfService quality, WorkIte
 {
     return std::thread([name = threadName(name), quality, body = std::move(body)]() mutable {
         pthread_setname_np(pthread_self(), name.c_str());
-        applyToCurrentThread(quality);
+        setQualityOfThisThread(quality);
         body();
     });
 }

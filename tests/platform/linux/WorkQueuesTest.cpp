@@ -455,6 +455,25 @@ TEST_F(WorkQueuesTest, PrioritiesFollowTheQualityOfServiceAsFarAsTheProcessMay)
     EXPECT_EQ(background, std::min(ofTheProcess + 10, 19));
 }
 
+TEST_F(WorkQueuesTest, AHelperHasThePriorityOfTheQueuesThatItHelpsAsLongAsItDoes)
+{
+    const int ofTheProcess = niceValue(0);
+    int ofTheQueue = 99;
+    const auto queue = makeQueue(QualityOfService::UserInteractive);
+    queue->submit([&] { ofTheQueue = niceValue(static_cast<id_t>(gettid())); });
+    drain(*queue);
+    {
+        const SerialQueue::Helper helper;
+        EXPECT_EQ(niceValue(0), ofTheQueue);
+        int ordinary = 99;
+        const auto ordinaryQueue = makeQueue(QualityOfService::Default);
+        ordinaryQueue->submit([&] { ordinary = niceValue(static_cast<id_t>(gettid())); });
+        drain(*ordinaryQueue);
+        EXPECT_EQ(ordinary, ofTheProcess) << "what a thread starts does not have its helper's priority";
+    }
+    EXPECT_EQ(niceValue(0), ofTheProcess);
+}
+
 TEST_F(WorkQueuesTest, BackgroundItemsRunSideBySideOnAFewThreads)
 {
     constexpr std::size_t items = 40;
