@@ -31,6 +31,15 @@ public:
         }
     }
 
+    // Answers to come hold their connections, which hold what answers.
+    ~CrowdedService()
+    {
+        for (const auto& connection : connections_)
+            connection->end();
+    }
+    CrowdedService(const CrowdedService&) = delete;
+    CrowdedService& operator=(const CrowdedService&) = delete;
+
     void find(std::int64_t reporterID)
     {
         const auto session = service_->findReportingSessionForID(reporterID);
@@ -50,6 +59,7 @@ private:
     class Connection final : public platform::Connection, public std::enable_shared_from_this<Connection> {
     public:
         void deliver(foundation::Array call) { (void)callHandler_({std::move(call), shared_from_this()}); }
+        void end() { callHandler_ = nullptr; }
 
     private:
         [[nodiscard]] std::int32_t processIdentifier() const override { return 1; }

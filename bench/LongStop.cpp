@@ -25,7 +25,7 @@ double millisecondsOfRoundTrip(RawClient& client)
 
 void measureLongStop(const Options& options, Report& report)
 {
-    const ServiceProcess service(options, "[]", ServiceProcess::Build::Internal);
+    const ServiceProcess service(options, "used = []", ServiceProcess::Build::Internal);
     RawClient other = service.makeClient();
     std::vector<double> longest;
     std::vector<double> usual;

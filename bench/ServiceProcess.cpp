@@ -18,7 +18,7 @@ constexpr std::string_view socketName = "kesto";
 
 } // namespace
 
-ServiceProcess::ServiceProcess(const Options& options, std::string_view used, Build build)
+ServiceProcess::ServiceProcess(const Options& options, std::string_view analytics, Build build)
 {
     const auto& root = directory_.path();
     std::vector<std::string> environment{fmt::format("KESTO_SERVICE_NAME={}", socketName)};
@@ -26,7 +26,7 @@ ServiceProcess::ServiceProcess(const Options& options, std::string_view used, Bu
         std::filesystem::create_directory(root / name);
         environment.push_back(fmt::format("{}_DIRECTORY={}", name, (root / name).native()));
     }
-    std::ofstream(root / "CONFIGURATION" / "analytics.toml") << "used = " << used << '\n';
+    std::ofstream(root / "CONFIGURATION" / "analytics.toml") << analytics << '\n';
     std::ofstream(root / "CONFIGURATION" / "device.toml")
         << "InternalBuild = " << (build == Build::Internal ? "true" : "false") << '\n';
     process_ = ChildProcess::execute({options.service}, environment, root / "log");

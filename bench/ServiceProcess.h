@@ -16,8 +16,9 @@ class ServiceProcess {
 public:
     enum class Build : std::uint8_t { Customer, Internal };
 
-    // `used` is the TOML array of the event names in use. Returns before the service listens.
-    explicit ServiceProcess(const Options& options, std::string_view used = "[]", Build build = Build::Customer);
+    // `analytics` is what analytics.toml says. Returns before the service listens.
+    explicit ServiceProcess(const Options& options, std::string_view analytics = "used = []",
+                            Build build = Build::Customer);
 
     [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
     [[nodiscard]] std::filesystem::path socketPath() const;

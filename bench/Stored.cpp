@@ -12,7 +12,7 @@ namespace bench {
 void measureStored(const Options& options, Report& report)
 {
     const std::string what = "sendMessage pipelined, two events stored";
-    const ServiceProcess service(options, "[\"com.quarn.*\"]\nmaximum_size_mb = 4096");
+    const ServiceProcess service(options, "used = [\"com.quarn.*\"]\nmaximum_size_mb = 4096");
     showProgress("starting a private journald");
     const auto journal = JournalPeer::start();
     for (const std::size_t count : {20'000, 200'000}) {

@@ -2,6 +2,7 @@
 #include "ChildProcess.h"
 #include "Groups.h"
 #include "InProcessPlatform.h"
+#include "platform/ExchangedProviders.h"
 #include "platform/linux/LinuxFileSystem.h"
 #include "platform/linux/LinuxPerformanceWriter.h"
 #include "platform/linux/LinuxWorkQueues.h"
@@ -115,22 +116,8 @@ public:
     TracingPlatform(platform::KernelTrace& kernelTrace, platform::FileSystem& files)
         : performanceWriter_(files, platform::ProviderLog(platform::current().log))
     {
-        const platform::Platform base = platform::current();
-        platform::install({.log = base.log,
-                           .clock = base.clock,
-                           .workQueues = workQueues_,
-                           .preferences = base.preferences,
-                           .featureFlags = base.featureFlags,
-                           .deviceProperties = base.deviceProperties,
-                           .processTable = base.processTable,
-                           .notifications = base.notifications,
-                           .analytics = base.analytics,
-                           .traceMarkers = base.traceMarkers,
-                           .reportingChannels = base.reportingChannels,
-                           .bugCapture = base.bugCapture,
-                           .kernelTrace = kernelTrace,
-                           .performanceWriter = performanceWriter_,
-                           .fileSystem = files});
+        platform::install(
+            platform::withExchanged(platform::current(), workQueues_, kernelTrace, performanceWriter_, files));
     }
 
 private:

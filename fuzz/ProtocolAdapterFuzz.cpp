@@ -1,6 +1,6 @@
 // What stands in a frame, as a call: whatever a client sends, either one operation is called and its answers go back
 // under the call's number, or the call is refused, and then nothing was called and nothing is answered. Nobody holds
-// the call's credit afterwards.
+// the caller's connection afterwards.
 //
 // The input is one CBOR item.
 #include "client/KestoReportingServiceProtocolAdapter.h"

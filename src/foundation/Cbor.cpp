@@ -298,7 +298,10 @@ std::vector<Value>& unfinishedValues()
 // is what `readAll` returns.
 class CborReader {
 public:
-    CborReader(std::string_view bytes, CborDecoder& decoder) : rest_(bytes), decoder_(decoder) { }
+    CborReader(std::string_view bytes, CborDecoder& decoder) : rest_(bytes), decoder_(decoder)
+    {
+        values_.clear(); // of one that ran out of memory
+    }
 
     std::expected<Value, CborError> readAll(unsigned maximumDepth)
     {

@@ -4,6 +4,7 @@
 #include "foundation/Value.h"
 
 #include <algorithm>
+#include <cassert>
 #include <numeric>
 #include <utility>
 
@@ -95,6 +96,7 @@ std::vector<std::uint32_t> firstOfMany(std::span<const String> keys)
 
 std::size_t foldRepeatedKeys(std::span<String> keys, std::span<Value> values)
 {
+    assert(keys.size() == values.size());
     auto places = keys.size() <= fewKeys ? firstOfFew(keys) : firstOfMany(keys);
     std::uint32_t kept = 0;
     for (std::uint32_t position = 0; position < keys.size(); ++position) {

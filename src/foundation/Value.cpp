@@ -7,6 +7,7 @@
 #include "foundation/Json.h"
 
 #include <algorithm>
+#include <cassert>
 #include <charconv>
 #include <cmath>
 #include <ctime>
@@ -190,6 +191,7 @@ void ArrayObject::destroy(const ArrayObject* object) noexcept
 
 const DictionaryObject* DictionaryObject::create(Reference<DictionaryShape> shape, std::span<Value> values)
 {
+    assert(values.size() == (shape ? shape->keys().size() : 0));
     return values.empty() ? nullptr : new (allocateWith<DictionaryObject>(values)) DictionaryObject(std::move(shape));
 }
 

@@ -172,26 +172,26 @@ NormalisedShape& rememberedShape(const foundation::DictionaryShape* of)
     return recent[std::hash<const void*>()(of) / alignof(std::max_align_t) % remembered];
 }
 
+// Remembers what became of the message's shape, unless keys fell together or there are many of them.
 foundation::Dictionary normaliseAnew(const foundation::Dictionary& message, const foundation::DictionaryEntry& tag,
-                                     NormalisedShape& result)
+                                     bool keepsTime, NormalisedShape& remembered)
 {
     std::vector<foundation::String> keys;
     std::vector<foundation::Value> values;
-    result.kept.clear();
+    std::vector<std::size_t> kept;
     for (std::size_t position = 0; position < message.size(); ++position) {
         auto key = withoutBlanks(message.keys()[position]);
-        if (!result.keepsTime && key == KestoReportingTimestampKey)
+        if (!keepsTime && key == KestoReportingTimestampKey)
             continue;
-        result.kept.push_back(position);
+        kept.push_back(position);
         keys.push_back(std::move(key));
         values.push_back(message.values()[position]);
     }
     keys.push_back(tag.key);
     values.push_back(tag.value);
     foundation::Dictionary normalised(std::move(keys), values);
-    const bool isSimple = normalised.size() == values.size() && normalised.shape()->isSmall();
-    result.shape = isSimple ? normalised.shape() : foundation::Reference<foundation::DictionaryShape>();
-    result.of = isSimple ? message.shape() : foundation::Reference<foundation::DictionaryShape>();
+    if (normalised.size() == values.size() && normalised.shape()->isSmall())
+        remembered = {message.shape(), keepsTime, std::move(kept), normalised.shape()};
     return normalised;
 }
 
@@ -203,10 +203,8 @@ foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::D
     const bool keepsTime = KestoReportingUtilityIsInternalBuild();
     const auto tag = audioMessageTag(category, type);
     NormalisedShape& known = rememberedShape(message.shape().get());
-    if (!known.shape || known.of.get() != message.shape().get() || known.keepsTime != keepsTime) {
-        known.keepsTime = keepsTime;
-        return normaliseAnew(message, tag, known);
-    }
+    if (!known.shape || known.of.get() != message.shape().get() || known.keepsTime != keepsTime)
+        return normaliseAnew(message, tag, keepsTime, known);
     std::vector<foundation::Value> values;
     values.reserve(known.kept.size() + 1);
     for (const std::size_t position : known.kept)

@@ -1,6 +1,7 @@
 // Driver logs of channels that are really published, as files: all of a session's road from the file to the event, with
 // everything that files may do in between.
 #include "driver/KestoReportingDriverUtility.h"
+#include "platform/ExchangedProviders.h"
 #include "platform/linux/LinuxReportingChannels.h"
 #include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
@@ -22,21 +23,7 @@ class DriverChannels : public testing::Test {
 protected:
     DriverChannels()
     {
-        platform::install({.log = fakes.log,
-                           .clock = fakes.clock,
-                           .workQueues = fakes.workQueues,
-                           .preferences = fakes.preferences,
-                           .featureFlags = fakes.featureFlags,
-                           .deviceProperties = fakes.deviceProperties,
-                           .processTable = fakes.processTable,
-                           .notifications = fakes.notifications,
-                           .analytics = fakes.analytics,
-                           .traceMarkers = fakes.traceMarkers,
-                           .reportingChannels = channels,
-                           .bugCapture = fakes.bugCapture,
-                           .kernelTrace = fakes.kernelTrace,
-                           .performanceWriter = fakes.performanceWriter,
-                           .fileSystem = fakes.fileSystem});
+        platform::install(platform::withExchanged(platform::current(), channels));
         fakes.analytics.use("com.quarn.kesto.*");
     }
 

@@ -41,7 +41,12 @@ void FakeConnection::close()
     if (std::exchange(isOver_, true))
         return;
     invalidationHandler_();
-    callHandler_ = nullptr; // nothing follows, so nothing is held any more
+    letGo(); // nothing follows, so nothing is held any more
+}
+
+void FakeConnection::letGo()
+{
+    callHandler_ = nullptr;
     interruptionHandler_ = nullptr;
     invalidationHandler_ = nullptr;
 }
@@ -76,9 +81,15 @@ Array FakeConnection::decoded(const std::string& frame)
     return value ? value->array().value_or(Array()) : Array();
 }
 
+FakeConnectionListener::~FakeConnectionListener()
+{
+    for (const auto& connection : connections_)
+        connection->letGo();
+}
+
 std::shared_ptr<FakeConnection> FakeConnectionListener::connect(std::int32_t processIdentifier)
 {
-    auto connection = std::make_shared<FakeConnection>(processIdentifier);
+    auto connection = connections_.emplace_back(std::make_shared<FakeConnection>(processIdentifier));
     EXPECT_TRUE(delegate_->shouldAcceptNewConnection(*this, connection)) << "connections are never refused";
     return connection;
 }

@@ -31,6 +31,8 @@ public:
     // The connection breaks: it is interrupted, then invalidated. Or interrupted only, for now.
     void breakOff();
     void interrupt();
+    // Lets its handlers go, which hold what will answer, which holds the connection.
+    void letGo();
 
     [[nodiscard]] bool isResumed() const { return isResumed_; }
 
@@ -61,6 +63,11 @@ private:
 // Hands connections to its delegate when the test has them come.
 class FakeConnectionListener final : public platform::ConnectionListener {
 public:
+    FakeConnectionListener() = default;
+    ~FakeConnectionListener() override;
+    FakeConnectionListener(const FakeConnectionListener&) = delete;
+    FakeConnectionListener& operator=(const FakeConnectionListener&) = delete;
+
     // A process connects.
     std::shared_ptr<FakeConnection> connect(std::int32_t processIdentifier);
 
@@ -70,6 +77,7 @@ public:
 
 private:
     platform::ConnectionListenerDelegate* delegate_ = nullptr;
+    std::vector<std::shared_ptr<FakeConnection>> connections_;
 };
 
 } // namespace support

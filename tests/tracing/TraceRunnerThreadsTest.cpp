@@ -1,6 +1,7 @@
 // Runners on real queues, with a kernel trace whose events come from a thread of its own: whatever happens at once,
 // results hold every interval that was delivered before the end, and nothing is touched by two threads. What two
 // threads must not do shows under the thread sanitizer.
+#include "platform/ExchangedProviders.h"
 #include "platform/linux/LinuxWorkQueues.h"
 #include "support/TestPlatform.h"
 #include "tracing/TraceParams.h"
@@ -80,22 +81,7 @@ class RunnerThreads : public testing::Test {
 protected:
     RunnerThreads()
     {
-        const platform::Platform fakes = platform::current();
-        platform::install({.log = fakes.log,
-                           .clock = fakes.clock,
-                           .workQueues = workQueues,
-                           .preferences = fakes.preferences,
-                           .featureFlags = fakes.featureFlags,
-                           .deviceProperties = fakes.deviceProperties,
-                           .processTable = fakes.processTable,
-                           .notifications = fakes.notifications,
-                           .analytics = fakes.analytics,
-                           .traceMarkers = fakes.traceMarkers,
-                           .reportingChannels = fakes.reportingChannels,
-                           .bugCapture = fakes.bugCapture,
-                           .kernelTrace = kernelTrace,
-                           .performanceWriter = fakes.performanceWriter,
-                           .fileSystem = fakes.fileSystem});
+        platform::install(platform::withExchanged(platform::current(), workQueues, kernelTrace));
         platform.log.setThreshold(platform::LogLevel::Error);
     }
 

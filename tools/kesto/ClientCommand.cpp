@@ -129,8 +129,10 @@ private:
         }
         if (status == kesto::Status::Ok)
             return;
-        const std::scoped_lock lock(lock_);
+        std::unique_lock lock(lock_);
         unanswered_ -= awaited;
+        if (status == kesto::Status::NotConnected) // which `stateChanged` is about to tell, in better words
+            changed_.wait_for(lock, std::chrono::duration<double>(options_.wait), [this] { return isOver_; });
         if (!isOver_)
             fmt::print(stderr, "kesto client: line {}: {}\n", number, kesto::errorText(status));
         hasFailed_ = true;

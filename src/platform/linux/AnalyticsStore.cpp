@@ -189,15 +189,14 @@ bool AnalyticsStore::take(Batch& batch)
 // False when it became quiet and that was waited for.
 bool AnalyticsStore::sleep()
 {
+    bool isQuiet = false;
     isAsleep_ = true;
-    const auto quiet = std::chrono::steady_clock::now() + quietTime;
-    bool isAwake = true;
     if (!writer_.awaitsQuiet())
         changed_.wait(lock_);
     else
-        isAwake = changed_.waitUntil(lock_, quiet) == std::cv_status::no_timeout;
+        isQuiet = changed_.waitUntil(lock_, std::chrono::steady_clock::now() + quietTime) == std::cv_status::timeout;
     isAsleep_ = false;
-    return isAwake;
+    return !isQuiet;
 }
 
 void AnalyticsStore::finish()

@@ -1,4 +1,4 @@
-// All texts stand in one buffer, behind each other: an event costs no allocation.
+// All texts stand in one buffer, behind each other, so that an event needs none of its own.
 #include "platform/linux/EventBatch.h"
 
 #include "foundation/Json.h"
@@ -13,18 +13,11 @@ namespace {
 constexpr std::size_t mostBytesKept = 256 * 1024;
 constexpr std::size_t mostElementsKept = 1024;
 
-void clear(std::string& text)
+template <typename Container> void clear(Container& container, std::size_t mostRoomKept)
 {
-    text.clear();
-    if (text.capacity() > mostBytesKept)
-        text = std::string();
-}
-
-template <typename Element> void clear(std::vector<Element>& elements)
-{
-    elements.clear();
-    if (elements.capacity() > mostElementsKept)
-        elements = std::vector<Element>();
+    container.clear();
+    if (container.capacity() > mostRoomKept)
+        container = Container();
 }
 
 } // namespace
@@ -48,7 +41,7 @@ void EventBatch::add(double time, std::string_view name, const foundation::Dicti
 void EventBatch::takeFrom(EventBatch& other)
 {
     if (events_.empty())
-        std::swap(*this, other);
+        return std::swap(*this, other);
     for (Event event : other.events_) {
         event.name.begin += texts_.size();
         event.payload += payloads_.size();
@@ -61,16 +54,16 @@ void EventBatch::takeFrom(EventBatch& other)
     texts_ += other.texts_;
     waitingBytes_ += other.waitingBytes_;
     if (!other.payloads_.empty())
-        lastPayload_ = other.lastPayload_;
+        lastPayload_ = std::move(other.lastPayload_);
     other.clear();
 }
 
 void EventBatch::clear()
 {
-    platform::clear(events_);
-    platform::clear(payloads_);
-    platform::clear(texts_);
-    platform::clear(rows_);
+    platform::clear(events_, mostElementsKept);
+    platform::clear(payloads_, mostElementsKept);
+    platform::clear(texts_, mostBytesKept);
+    platform::clear(rows_, mostElementsKept);
     lastPayload_ = {};
     waitingBytes_ = 0;
 }

@@ -1,8 +1,8 @@
 // Events on their way to the database, written out as they will stand there.
 //
-// A payload becomes JSON when its event is added, on the thread that built it, and goes: taken apart on the store's
-// thread, every string that it shares with other messages would wander between two processors. Only a large payload
-// waits for the store's thread, because clients wait for the one that adds it.
+// A payload becomes JSON when its event is added, on the thread that built it: taken apart on the store's thread, every
+// string that it shares with other messages would wander between two processors. Only a large payload waits for the
+// store's thread, because clients wait for the one that adds it.
 #pragma once
 
 #include "foundation/Value.h"

@@ -14,8 +14,8 @@
 namespace platform {
 namespace {
 
-// What stays of a log that grew for a while, once it begins anew.
-constexpr std::uint64_t mostLogKept = 16 * 1024 * 1024;
+// What stays of a log once it begins anew: as much as a burst needs.
+constexpr std::uint64_t mostLogKept = 32 * 1024 * 1024;
 
 bool isForWantOfRoom(int systemError)
 {

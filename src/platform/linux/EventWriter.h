@@ -49,8 +49,8 @@ public:
     void keep(EventBatch& events);
     // Whether some housekeeping waits for a quiet moment.
     [[nodiscard]] bool awaitsQuiet() const;
-    // Does some of the housekeeping that is due; true when more is left to do. `isQuiet`: nothing was to be kept for a
-    // while.
+    // Does some of the housekeeping that is due; true when more is left to do. `isQuiet`: nothing is to be
+    // kept now.
     bool maintain(bool isQuiet);
 
     // Any thread.

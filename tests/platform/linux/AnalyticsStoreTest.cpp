@@ -63,6 +63,13 @@ protected:
         queue->submit(std::move(items));
         ended.get_future().wait();
     }
+    // 120 events, which take so much that the log wants to be moved to the database.
+    void sendALongLog()
+    {
+        for (int number = 0; number < 120; ++number)
+            store().sendAnalyticsEventLazy(eventName, [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
+        store().flush();
+    }
     [[nodiscard]] std::int64_t storedEvents() { return StoreReader(file).eventCount(); }
 
     // Keeps the store's thread busy until it is released: nothing is written meanwhile.
@@ -359,12 +366,17 @@ TEST_F(AnalyticsStoreTest, ATurnLargerThanTheBacklogIsKeptWhole)
     EXPECT_EQ(stored.get_future().get(), 1000);
 }
 
+TEST_F(AnalyticsStoreTest, EndsWhileItWaitsForAQuietMoment)
+{
+    sendALongLog();
+    closeStore();
+    EXPECT_EQ(storedEvents(), 120);
+}
+
 TEST_F(AnalyticsStoreTest, ALongLogIsMovedToTheDatabaseOnceItIsQuiet)
 {
     constexpr std::uintmax_t megabyte = 1024 * 1024;
-    for (int number = 0; number < 120; ++number)
-        store().sendAnalyticsEventLazy(eventName, [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
-    store().flush();
+    sendALongLog();
     for (int tries = 0; tries < 1000 && fs::file_size(file) < 8 * megabyte; ++tries)
         std::this_thread::sleep_for(10ms);
     EXPECT_GT(fs::file_size(file), 8 * megabyte);

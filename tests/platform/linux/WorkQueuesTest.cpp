@@ -462,6 +462,8 @@ TEST_F(WorkQueuesTest, AHelperHasThePriorityOfTheQueuesThatItHelpsAsLongAsItDoes
     const auto queue = makeQueue(QualityOfService::UserInteractive);
     queue->submit([&] { ofTheQueue = niceValue(static_cast<id_t>(gettid())); });
     drain(*queue);
+    if (ofTheQueue == ofTheProcess)
+        GTEST_SKIP() << "this process may not raise priorities";
     {
         const SerialQueue::Helper helper;
         EXPECT_EQ(niceValue(0), ofTheQueue);
