@@ -83,13 +83,15 @@ Array FakeConnection::decoded(const std::string& frame)
 
 FakeConnectionListener::~FakeConnectionListener()
 {
-    for (const auto& connection : connections_)
-        connection->letGo();
+    for (const auto& known : connections_)
+        if (const auto connection = known.lock())
+            connection->letGo();
 }
 
 std::shared_ptr<FakeConnection> FakeConnectionListener::connect(std::int32_t processIdentifier)
 {
-    auto connection = connections_.emplace_back(std::make_shared<FakeConnection>(processIdentifier));
+    auto connection = std::make_shared<FakeConnection>(processIdentifier);
+    connections_.push_back(connection);
     EXPECT_TRUE(delegate_->shouldAcceptNewConnection(*this, connection)) << "connections are never refused";
     return connection;
 }

@@ -77,7 +77,7 @@ public:
 
 private:
     platform::ConnectionListenerDelegate* delegate_ = nullptr;
-    std::vector<std::shared_ptr<FakeConnection>> connections_;
+    std::vector<std::weak_ptr<FakeConnection>> connections_;
 };
 
 } // namespace support
