@@ -213,8 +213,8 @@ private:
 
 // An immutable, shared dictionary in the order of insertion. Any thread.
 //
-// One is made from a list of entries, in which an entry whose key stands earlier replaces that entry's value and takes
-// its place. Changing is making a new one; whoever gathers many entries gathers them in a vector.
+// Made from a list of entries, in which one whose key stands earlier replaces that entry's value in its place; or from
+// keys or a shape that are there already. Changing is making a new one; many entries are gathered in a vector.
 class Dictionary {
 public:
     using Entries = std::vector<DictionaryEntry>;
