@@ -179,6 +179,9 @@ foundation::Dictionary normaliseAnew(const foundation::Dictionary& message, cons
     std::vector<foundation::String> keys;
     std::vector<foundation::Value> values;
     std::vector<std::size_t> kept;
+    keys.reserve(message.size() + 1);
+    values.reserve(message.size() + 1);
+    kept.reserve(message.size());
     for (std::size_t position = 0; position < message.size(); ++position) {
         auto key = withoutBlanks(message.keys()[position]);
         if (!keepsTime && key == KestoReportingTimestampKey)
@@ -202,8 +205,9 @@ foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::D
 {
     const bool keepsTime = KestoReportingUtilityIsInternalBuild();
     const auto tag = audioMessageTag(category, type);
-    NormalisedShape& known = rememberedShape(message.shape().get());
-    if (!known.shape || known.of.get() != message.shape().get() || known.keepsTime != keepsTime)
+    const auto shape = message.shape();
+    NormalisedShape& known = rememberedShape(shape.get());
+    if (!known.shape || known.of.get() != shape.get() || known.keepsTime != keepsTime)
         return normaliseAnew(message, tag, keepsTime, known);
     std::vector<foundation::Value> values;
     values.reserve(known.kept.size() + 1);
