@@ -13,8 +13,11 @@ namespace {
 
 constexpr std::size_t fewKeys = 16;
 
+// Where there are many; empty for few.
 std::vector<std::uint32_t> sortedPositions(std::span<const String> keys)
 {
+    if (keys.size() <= fewKeys)
+        return {};
     std::vector<std::uint32_t> positions(keys.size());
     std::iota(positions.begin(), positions.end(), 0U);
     std::ranges::sort(positions, {}, [keys](auto position) { return std::pair(keys[position].view(), position); });
@@ -25,13 +28,8 @@ std::vector<std::uint32_t> sortedPositions(std::span<const String> keys)
 
 Reference<DictionaryShape> DictionaryShape::make(std::vector<String> keys)
 {
-    return Reference<DictionaryShape>::adopt(new DictionaryShape(std::move(keys)));
-}
-
-DictionaryShape::DictionaryShape(std::vector<String> keys) : keys_(std::move(keys))
-{
-    if (keys_.size() > fewKeys)
-        sorted_ = sortedPositions(keys_);
+    auto sorted = sortedPositions(keys);
+    return Reference<DictionaryShape>::adopt(new DictionaryShape(std::move(keys), std::move(sorted)));
 }
 
 bool DictionaryShape::isSmall() const noexcept
@@ -79,10 +77,9 @@ std::vector<std::uint32_t> firstOfFew(std::span<const String> keys)
     return firsts;
 }
 
-std::vector<std::uint32_t> firstOfMany(std::span<const String> keys)
+std::vector<std::uint32_t> firstOfMany(std::span<const String> keys, std::span<const std::uint32_t> sorted)
 {
     std::vector<std::uint32_t> firsts(keys.size());
-    const auto sorted = sortedPositions(keys);
     std::uint32_t first = sorted.front();
     for (const std::uint32_t position : sorted) {
         if (keys[position] != keys[first])
@@ -92,26 +89,39 @@ std::vector<std::uint32_t> firstOfMany(std::span<const String> keys)
     return firsts;
 }
 
-} // namespace
-
-std::size_t foldRepeatedKeys(std::span<String> keys, std::span<Value> values)
+// Moves what is distinct to the front; `firsts` is, by position, that of the first such key. Returns how many these
+// are.
+std::size_t moveToFront(std::span<std::uint32_t> firsts, std::span<String> keys, std::span<Value> values)
 {
-    assert(keys.size() == values.size());
-    auto places = keys.size() <= fewKeys ? firstOfFew(keys) : firstOfMany(keys);
     std::uint32_t kept = 0;
     for (std::uint32_t position = 0; position < keys.size(); ++position) {
-        const std::uint32_t first = places[position];
+        const std::uint32_t first = firsts[position];
         if (first != position) {
-            values[places[first]] = std::move(values[position]);
+            values[firsts[first]] = std::move(values[position]);
             continue;
         }
-        const std::uint32_t place = places[position] = kept++;
+        const std::uint32_t place = firsts[position] = kept++;
         if (place == position)
             continue;
         keys[place] = std::move(keys[position]);
         values[place] = std::move(values[position]);
     }
     return kept;
+}
+
+} // namespace
+
+Reference<DictionaryShape> DictionaryShape::fold(std::vector<String> keys, std::span<Value>& values)
+{
+    assert(!keys.empty() && keys.size() == values.size());
+    auto sorted = sortedPositions(keys);
+    auto firsts = sorted.empty() ? firstOfFew(keys) : firstOfMany(keys, sorted);
+    const std::size_t distinct = moveToFront(firsts, keys, values);
+    if (distinct == keys.size())
+        return Reference<DictionaryShape>::adopt(new DictionaryShape(std::move(keys), std::move(sorted)));
+    keys.resize(distinct);
+    values = values.first(distinct);
+    return make(std::move(keys));
 }
 
 } // namespace foundation

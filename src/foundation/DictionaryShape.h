@@ -11,15 +11,21 @@
 #include <optional>
 #include <span>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace foundation {
+
+class Value;
 
 // Immutable. Any thread.
 class DictionaryShape : public ReferenceCounted {
 public:
     // The keys are distinct.
     [[nodiscard]] static Reference<DictionaryShape> make(std::vector<String> keys);
+    // Of keys that may repeat, at least one, and a value for each: a later value of a key replaces its first one. As
+    // many of the values stay, in front, as there are distinct keys.
+    [[nodiscard]] static Reference<DictionaryShape> fold(std::vector<String> keys, std::span<Value>& values);
     static void destroy(const DictionaryShape* shape) noexcept { delete shape; }
 
     [[nodiscard]] std::span<const String> keys() const noexcept { return keys_; }
@@ -28,16 +34,16 @@ public:
     [[nodiscard]] std::optional<std::size_t> positionOf(std::string_view key) const noexcept;
 
 private:
-    explicit DictionaryShape(std::vector<String> keys);
+    DictionaryShape(std::vector<String> keys, std::vector<std::uint32_t> sorted) noexcept
+        : keys_(std::move(keys)),
+          sorted_(std::move(sorted))
+    {
+    }
 
     const std::vector<String> keys_;
     // Where there are many, their positions in the order of their characters. Sorted rather than hashed: no choice of
     // keys, however hostile, makes it slow.
-    std::vector<std::uint32_t> sorted_;
+    const std::vector<std::uint32_t> sorted_;
 };
-
-// Makes keys distinct: a later value of a key replaces its first one. Returns how many are left; they stand at the
-// front of both.
-[[nodiscard]] std::size_t foldRepeatedKeys(std::span<String> keys, std::span<class Value> values);
 
 } // namespace foundation

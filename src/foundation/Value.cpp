@@ -209,10 +209,10 @@ bool operator==(const Array& left, const Array& right) noexcept
 
 Dictionary::Dictionary(std::vector<String> keys, std::span<Value> values)
 {
-    const std::size_t distinct = foldRepeatedKeys(keys, values);
-    keys.resize(distinct);
-    if (distinct != 0)
-        *this = Dictionary(DictionaryShape::make(std::move(keys)), values.first(distinct));
+    if (keys.empty())
+        return;
+    auto shape = DictionaryShape::fold(std::move(keys), values);
+    *this = Dictionary(std::move(shape), values);
 }
 
 Dictionary::Dictionary(Entries entries)
