@@ -23,6 +23,7 @@ const Value null;
 constexpr int playback = 4;
 constexpr int typeStart = 1;
 constexpr int typeStop = 2;
+constexpr std::string_view uptimeEvent = "com.quarn.kesto.kestoreportingclientuptime";
 
 Array success(std::uint64_t call)
 {
@@ -175,7 +176,7 @@ TEST_F(RoadTest, AClientThatDisconnectsLeavesAnUptimeEvent)
     client.call(Start, 1);
     client.ask(GetAllReporters);
     client.close();
-    const auto events = kestod.waitForEvents("com.quarn.kesto.kestoreportingclientuptime");
+    const auto events = kestod.waitForEvents(uptimeEvent);
     ASSERT_THAT(events, SizeIs(1));
     EXPECT_THAT(events[0].payload, MatchesRegex(R"(\{"processName":"end_to_end_test","seconds":[0-9.e-]+\})"));
     EXPECT_TRUE(kestod.waitForLog("ending session 1"));
@@ -197,6 +198,44 @@ TEST_F(RoadTest, AResetIsAnInterruptionAndThenAnInvalidationAndStopsSessionsOnce
     ASSERT_NE(interruption, std::string::npos);
     EXPECT_NE(log.find("invalidationHandler: connection exited", interruption), std::string::npos);
     EXPECT_EQ(kestod.countInLog("ending session 77"), 2U); // both lines of one stop
+    EXPECT_THAT(kestod.waitForEvents(uptimeEvent), SizeIs(1));
+}
+
+// A connection may be over before the server queue, which is busy with others, comes to register it. It then has no
+// uptime yet, and the log says so; it is registered and removed all the same.
+TEST(CrowdedRoadTest, EveryConnectionThatComesAndVanishesBesideABusyClientIsRegisteredAndRemoved)
+{
+    constexpr std::size_t connections = 10'000;
+    Kestod kestod({}, {{"KESTO_LOG", "default"}});
+    kestod.startAndAwait(); // with a first connection, which is gone at once
+    std::jthread busy([&](const std::stop_token& isOver) {
+        WireClient client(kestod.socketPath());
+        client.ask(Create, 1);
+        client.call(Start, 1);
+        while (!isOver.stop_requested()) {
+            constexpr int burst = 5'000; // more than the connection thread works off itself
+            client.sendFrame(Array{0, static_cast<int>(Validate), 1}, burst);
+            for (int number = 0; number < burst; ++number)
+                ASSERT_TRUE(client.nextReply());
+        }
+    });
+    for (std::size_t number = 0; number < connections; ++number) {
+        WireClient client(kestod.socketPath());
+        if (number % 2 == 0)
+            client.sendBytes("\x05"); // the stream ends inside a frame: an interruption
+    }
+    busy.request_stop();
+    busy.join();
+
+    constexpr std::size_t all = connections + 2;
+    EXPECT_TRUE(waitUntil([&] { return kestod.countInLog("from the server client list") == 2 * all; }))
+        << "removed and freed";
+    EXPECT_EQ(kestod.countInLog("new client with pid"), all);
+    EXPECT_EQ(kestod.countInLog(" removing "), all);
+    EXPECT_EQ(kestod.countInLog(" dealloc "), all);
+    EXPECT_EQ(kestod.countInLog("interruptionHandler: connection exited"), connections / 2);
+    EXPECT_EQ(kestod.countInLog("invalidationHandler: connection exited"), all);
+    EXPECT_EQ(kestod.events(uptimeEvent).size() + kestod.countInLog("clientProcessName is nil"), all);
 }
 
 TEST_F(RoadTest, KillServiceEndsTheProcessWithStatus2)

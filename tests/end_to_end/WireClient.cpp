@@ -28,6 +28,14 @@ platform::FileDescriptor connectTo(const std::filesystem::path& socketPath)
     return socket;
 }
 
+std::string framed(std::string_view item)
+{
+    std::string frame;
+    for (unsigned shift = 0; shift < 32; shift += 8)
+        frame.push_back(static_cast<char>(item.size() >> shift));
+    return frame.append(item);
+}
+
 } // namespace
 
 WireClient::WireClient(const std::filesystem::path& socketPath)
@@ -52,17 +60,17 @@ void WireClient::sendBytes(std::string_view bytes)
 
 void WireClient::sendFrameBytes(std::string_view item)
 {
-    std::string frame;
-    for (unsigned shift = 0; shift < 32; shift += 8)
-        frame.push_back(static_cast<char>(item.size() >> shift));
-    sendBytes(frame.append(item));
+    sendBytes(framed(item));
 }
 
-void WireClient::sendFrame(const foundation::Value& item)
+void WireClient::sendFrame(const foundation::Value& item, int times)
 {
     std::string encoded;
     foundation::appendCbor(item, encoded);
-    sendFrameBytes(encoded);
+    std::string frames;
+    while (times-- > 0)
+        frames += framed(encoded);
+    sendBytes(frames);
 }
 
 void WireClient::reset()

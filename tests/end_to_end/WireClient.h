@@ -53,7 +53,8 @@ public:
     // Whether the service closes the connection without another reply.
     [[nodiscard]] bool isClosed() { return !nextReply(); }
 
-    void sendFrame(const foundation::Value& item);
+    // Sends the frame, so many times in one piece.
+    void sendFrame(const foundation::Value& item, int times = 1);
     void sendFrameBytes(std::string_view item);
     void sendBytes(std::string_view bytes);
     // Ends the connection between frames.

@@ -400,21 +400,21 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
     }
     if (hasAskedForTraceMarker_ && hub_->traceAccess != nullptr)
         hub_->traceAccess->forget(this);
-    // The handlers go with the connection: they may hold it.
-    callHandler_ = nullptr;
-    EndHandler interrupted = std::exchange(interruptionHandler_, nullptr);
-    EndHandler invalidated = std::exchange(invalidationHandler_, nullptr);
     if (readingPauses != 0 || droppedBytes_ != 0)
         KESTO_LOG(hub_->log, Default, "{} was behind: reading paused {} times, {} bytes of answers were dropped",
                   description(), readingPauses, droppedBytes_.load());
     if (interruptedBecause) {
         ++hub_->counters.interrupted;
         KESTO_LOG(hub_->log, Default, "{} ends: {}", description(), *interruptedBecause);
-        if (interrupted)
-            interrupted();
+        if (interruptionHandler_)
+            interruptionHandler_();
     }
-    if (invalidated)
-        invalidated();
+    if (invalidationHandler_)
+        invalidationHandler_();
+    // Only now: the call handler holds what the other two end, and all of them may hold the connection.
+    callHandler_ = nullptr;
+    interruptionHandler_ = nullptr;
+    invalidationHandler_ = nullptr;
 }
 
 } // namespace platform

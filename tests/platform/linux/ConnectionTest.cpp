@@ -262,6 +262,41 @@ TEST_F(Connections, ServeAThousandClientsAtOnce)
 
 class ConnectionEnds : public support::ConnectionTest { };
 
+// Its call handler alone holds an object, which the other two reach weakly, as the service has it with its clients.
+class ConnectionsOfAnObject : public support::ConnectionTest {
+public:
+    bool shouldAcceptNewConnection(ConnectionListener&, const std::shared_ptr<Connection>& connection) override
+    {
+        const auto object = std::make_shared<int>();
+        weakObject = object;
+        const auto note = [this](std::string event) {
+            event += weakObject.expired() ? " without it" : " with it";
+            progress.change([&] { history.push_back(std::move(event)); });
+        };
+        connection->setCallHandler([object](Connection::Call) { return std::expected<void, Connection::Violation>(); });
+        connection->setInterruptionHandler([note] { note("interrupted"); });
+        connection->setInvalidationHandler([note] { note("invalidated"); });
+        connection->resume();
+        return true;
+    }
+
+protected:
+    std::weak_ptr<int> weakObject;
+    std::vector<std::string> history;
+};
+
+TEST_F(ConnectionsOfAnObject, HoldItUntilTheirLastHandlerHasReturned)
+{
+    listen();
+    Client client(path);
+    client.write("\x05");
+    client.close();
+    EXPECT_TRUE(progress.waitFor([&] { return history.size() == 2; }));
+    EXPECT_THAT(history, ElementsAre("interrupted with it", "invalidated with it"));
+    stop();
+    EXPECT_TRUE(weakObject.expired());
+}
+
 TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerClosesBetweenFrames)
 {
     listen();
