@@ -7,6 +7,7 @@
 #include "support/FakeLog.h"
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
+#include "support/Threads.h"
 
 #include <chrono>
 #include <condition_variable>
@@ -287,27 +288,22 @@ TEST_F(LinuxPreferencesTest, DomainsBeyondThoseKeptAreStillRead)
 
 // --- The watcher
 
-std::size_t threadCount()
-{
-    return static_cast<std::size_t>(std::distance(fs::directory_iterator("/proc/self/task"), fs::directory_iterator()));
-}
-
 TEST_F(LinuxPreferencesTest, NoThreadIsStartedBeforeSomebodyWatches)
 {
-    const std::size_t before = threadCount();
+    const std::size_t before = support::threadsOfTheProcess();
     ConfigurationWatcher unused(root, ProviderLog(log));
-    EXPECT_EQ(threadCount(), before);
+    EXPECT_EQ(support::threadsOfTheProcess(), before);
     makePreferences();
-    EXPECT_EQ(threadCount(), before + 1);
+    EXPECT_EQ(support::threadsOfTheProcess(), before + 1);
 }
 
 TEST_F(LinuxPreferencesTest, AllOfTheConfigurationSharesOneThread)
 {
     makePreferences();
-    const std::size_t before = threadCount();
+    const std::size_t before = support::threadsOfTheProcess();
     const LinuxFeatureFlags flags(*watcher, ProviderLog(log));
     const LinuxDeviceProperties properties(*watcher, ProviderLog(log));
-    EXPECT_EQ(threadCount(), before);
+    EXPECT_EQ(support::threadsOfTheProcess(), before);
 }
 
 TEST_F(LinuxPreferencesTest, WithoutRoomForAWatchTheServiceGoesOnAndSaysSo)

@@ -3,11 +3,11 @@
 #include "platform/linux/LinuxWorkQueues.h"
 #include "platform/linux/SerialQueue.h"
 #include "platform/linux/Thread.h"
+#include "support/Threads.h"
 
 #include <algorithm>
 #include <array>
 #include <atomic>
-#include <filesystem>
 #include <fstream>
 #include <gtest/gtest.h>
 #include <latch>
@@ -23,6 +23,7 @@ namespace platform {
 namespace {
 
 using namespace std::chrono_literals;
+using support::threadsOfTheProcess;
 
 class WorkQueuesTest : public testing::Test {
 protected:
@@ -47,12 +48,6 @@ std::string nameOfThisThread()
     std::array<char, 16> name = {};
     pthread_getname_np(pthread_self(), name.data(), name.size());
     return name.data();
-}
-
-std::size_t threadsOfTheProcess()
-{
-    return static_cast<std::size_t>(
-        std::distance(std::filesystem::directory_iterator("/proc/self/task"), std::filesystem::directory_iterator()));
 }
 
 int niceValue(id_t id)
