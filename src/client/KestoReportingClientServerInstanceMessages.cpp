@@ -2,7 +2,6 @@
 //
 // With a list of reporters the sinks come first and the session last; without one, the session comes first.
 // Both orders are part of the contract.
-#define KESTO_LOG_FILE "KestoReportingClientServerInstance"
 #include "client/KestoReportingClientServerInstance.h"
 #include "foundation/Format.h"
 #include "platform/Connection.h"

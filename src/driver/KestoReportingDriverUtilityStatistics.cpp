@@ -1,6 +1,5 @@
 // How the drivers' channels changed over a session, put into words: one entry a channel, in a dictionary for
 // each kind of channel.
-#define KESTO_LOG_FILE "KestoReportingDriverUtility"
 #include "driver/KestoReportingDriverUtility.h"
 #include "foundation/Format.h"
 #include "platform/Platform.h"

@@ -21,7 +21,7 @@ std::string_view name(LogLevel level) noexcept
 
 std::string logPrefix(const LogLocation& location)
 {
-    return fmt::format("{:>25}:{:<5} ", location.file, location.line);
+    return fmt::format("{:>25}:{:<5} ", location.name, location.line);
 }
 
 void writeFormattedLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,

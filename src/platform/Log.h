@@ -1,7 +1,7 @@
 // Log categories and the statements that write to them.
 //
 // A statement below its category's threshold costs a load and a branch: nothing of it is evaluated.
-// Above it, the line starts with the source file's name, right-aligned, and the line number, so that a
+// Above it, the line starts with a name for the source file, right-aligned, and the line number, so that a
 // reader finds the statement; the sink decides where the line goes.
 #pragma once
 
@@ -53,8 +53,17 @@ private:
 
 // Where a log statement stands.
 struct LogLocation {
-    std::string_view file; // without folder and extension
-    int line = 0;
+    // Of a path such as __FILE__. The prefix shows the file's name without its extension, unless it is given another.
+    consteval LogLocation(std::string_view path, int lineNumber, std::string_view shownName = {})
+        : file(path.substr(path.rfind('/') + 1)),
+          line(lineNumber),
+          name(shownName.empty() ? file.substr(0, file.rfind('.')) : shownName)
+    {
+    }
+
+    std::string_view file; // "KestoReportingSessionVolume.cpp"
+    int line;
+    std::string_view name; // "KestoReportingSession"
 };
 
 struct LogRecord {
@@ -72,7 +81,7 @@ public:
     virtual void write(const LogRecord& record) = 0;
 };
 
-// The prefix that every line starts with: the file right-aligned in 25 columns, the line left-aligned in 5.
+// The prefix that every line starts with: the name right-aligned in 25 columns, the line left-aligned in 5.
 [[nodiscard]] std::string logPrefix(const LogLocation& location);
 
 // Formats the message and hands it to the current platform's log.
@@ -87,29 +96,20 @@ void writeLog(const LogCategory& category, LogLevel level, LogLocation location,
     writeFormattedLog(category, level, location, format, fmt::make_format_args(arguments...));
 }
 
-// "/a/b/Name.cpp" is "Name".
-consteval std::string_view baseName(std::string_view path)
-{
-    if (const auto slash = path.rfind('/'); slash != std::string_view::npos)
-        path.remove_prefix(slash + 1);
-    return path.substr(0, path.rfind('.'));
-}
-
 } // namespace platform
 
-// The file that log lines name. A file that continues a class in the way of another one names that other one,
-// defined before anything is included: readers of the log know classes, not how their code is cut.
-#ifndef KESTO_LOG_FILE
-#define KESTO_LOG_FILE __FILE__
+// What the prefix shows in place of the file's name: the files of the session and of the trace runner, whose lines
+// programs search for by that name, define it before they include anything.
+#ifndef KESTO_LOG_NAME
+#define KESTO_LOG_NAME ""
 #endif
 
 // KESTO_LOG(category, level, "format of {fmt}", arguments...)
-#define KESTO_LOG(logCategory, logLevel, ...)                                                                \
-    do {                                                                                                     \
-        ::platform::LogCategory& kestoLogCategory = (logCategory);                                           \
-        if (kestoLogCategory.isEnabled(::platform::LogLevel::logLevel)) [[unlikely]] {                       \
-            constexpr std::string_view kestoLogFile = ::platform::baseName(KESTO_LOG_FILE);                  \
-            ::platform::writeLog(kestoLogCategory, ::platform::LogLevel::logLevel, {kestoLogFile, __LINE__}, \
-                                 __VA_ARGS__);                                                               \
-        }                                                                                                    \
+#define KESTO_LOG(logCategory, logLevel, ...)                                                                      \
+    do {                                                                                                           \
+        ::platform::LogCategory& kestoLogCategory = (logCategory);                                                 \
+        if (kestoLogCategory.isEnabled(::platform::LogLevel::logLevel)) [[unlikely]] {                             \
+            constexpr ::platform::LogLocation kestoLogLocation(__FILE__, __LINE__, KESTO_LOG_NAME);                \
+            ::platform::writeLog(kestoLogCategory, ::platform::LogLevel::logLevel, kestoLogLocation, __VA_ARGS__); \
+        }                                                                                                          \
     } while (false)

@@ -1,6 +1,5 @@
 // A connection's beginning and end: the client object is made and registered, and when the peer is gone its
 // sessions are stopped and the time it was connected becomes an event.
-#define KESTO_LOG_FILE "KestoReportingServiceDelegate"
 #include "client/KestoReportingClientServerInstance.h"
 #include "client/KestoReportingServerQueue.h"
 #include "client/KestoReportingServiceProtocolAdapter.h"

@@ -1,6 +1,5 @@
 // Device-wide settings as messages: the accessory setting of the home screen, the device's name and the ringer
 // switch are sent to a session when it starts, and to all sessions when one of them changes.
-#define KESTO_LOG_FILE "KestoReportingServiceDelegate"
 #include "client/KestoReportingClientServerInstance.h"
 #include "client/KestoReportingServerQueue.h"
 #include "platform/Platform.h"

@@ -1,5 +1,5 @@
 // Receiving a message: it is normalised, compared with the one before of its kind, and recorded.
-#define KESTO_LOG_FILE "KestoReportingSession"
+#define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
 #include "utility/KestoReportingTraceCodes.h"

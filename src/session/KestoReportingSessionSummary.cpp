@@ -1,6 +1,6 @@
 // The session's summary: every value that each key took, in one event, and on internal builds the whole message
 // store as a file that diagnostic tools read.
-#define KESTO_LOG_FILE "KestoReportingSession"
+#define KESTO_LOG_NAME "KestoReportingSession"
 #include "foundation/Format.h"
 #include "foundation/LocalTime.h"
 #include "foundation/PrettyJsonWriter.h"

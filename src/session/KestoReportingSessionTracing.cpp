@@ -1,5 +1,5 @@
 // The trace of a session: under which conditions one is run, from the parameters file that the configuration names.
-#define KESTO_LOG_FILE "KestoReportingSession"
+#define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
 #include "tracing/TraceParams.h"

@@ -2,7 +2,7 @@
 // which output ran in one and the same way becomes a volume event.
 //
 // The switches of spatial audio arrive in bursts, which are folded into one payload first.
-#define KESTO_LOG_FILE "KestoReportingSession"
+#define KESTO_LOG_NAME "KestoReportingSession"
 #include "session/KestoReportingRapidMessages.h"
 #include "session/KestoReportingSession.h"
 #include "session/KestoReportingVolumeFields.h"

@@ -1,5 +1,5 @@
 // The end of a runner's work: a summary of each name in the log, and every value in the results file.
-#define KESTO_LOG_FILE "TraceRunner"
+#define KESTO_LOG_NAME "TraceRunner"
 #include "platform/Platform.h"
 #include "tracing/TraceRunner.h"
 #include "utility/KestoReportingLogCategories.h"

@@ -46,7 +46,8 @@ TEST_F(LogTest, ALineSaysWhereItStands)
     const int line = __LINE__ - 1;
     const auto lines = platform_.log.take();
     ASSERT_EQ(lines.size(), 1U);
-    EXPECT_EQ(lines[0].file, "LogTest");
+    EXPECT_EQ(lines[0].file, "LogTest.cpp");
+    EXPECT_EQ(lines[0].name, "LogTest");
     EXPECT_EQ(lines[0].line, line);
     EXPECT_EQ(lines[0].subsystem, subsystem);
 }
@@ -130,12 +131,22 @@ TEST(LogPrefix, LongNamesAreNotCut)
     EXPECT_EQ(logPrefix({"KestoReportingServiceDelegate", 123456}), "KestoReportingServiceDelegate:123456 ");
 }
 
-TEST(LogLocation, IsTheFileWithoutFoldersAndExtension)
+TEST(LogLocation, HasTheFileWithoutFoldersAndIsShownWithoutExtension)
 {
-    static_assert(baseName("/a/b/Name.cpp") == "Name");
-    static_assert(baseName("Name.cpp") == "Name");
-    static_assert(baseName("/a.d/Name") == "Name");
-    static_assert(baseName("src/Two.Dots.cpp") == "Two.Dots");
+    constexpr LogLocation inFolders("/a.d/b/Name.cpp", 7);
+    EXPECT_EQ(inFolders.file, "Name.cpp");
+    EXPECT_EQ(inFolders.name, "Name");
+    EXPECT_EQ(inFolders.line, 7);
+    EXPECT_EQ(LogLocation("Name.cpp", 1).name, "Name");
+    EXPECT_EQ(LogLocation("/a.d/Name", 1).name, "Name");
+    EXPECT_EQ(LogLocation("src/Two.Dots.cpp", 1).name, "Two.Dots");
+}
+
+TEST(LogLocation, IsShownUnderTheNameThatItIsGiven)
+{
+    constexpr LogLocation location("/a/ClassContinued.cpp", 7, "Class");
+    EXPECT_EQ(location.file, "ClassContinued.cpp");
+    EXPECT_EQ(location.name, "Class");
 }
 
 TEST(LogLevel, HasAName)

@@ -118,7 +118,7 @@ TEST_F(SessionStop, SaysWhatItDoesAtItsLevel)
     EXPECT_THAT(lines[7], sending);
     EXPECT_THAT(platform.log.lines("keri"), SizeIs(4));
     for (const auto& line : platform.log.lines())
-        EXPECT_EQ(line.file, "KestoReportingSession");
+        EXPECT_EQ(line.name, "KestoReportingSession");
 }
 
 TEST_F(SessionStop, MarksItsMomentsForTheKernelTrace)

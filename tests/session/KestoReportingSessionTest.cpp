@@ -55,7 +55,7 @@ TEST_F(SessionTest, IsMadeWithItsIdentityAndNothingElse)
 TEST_F(SessionTest, SaysAndMarksThatItWasMade)
 {
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "created reporting session for ID: 42")));
-    EXPECT_EQ(platform.log.lines()[0].file, "KestoReportingSession");
+    EXPECT_EQ(platform.log.lines()[0].name, "KestoReportingSession");
     EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(created));
 }
 

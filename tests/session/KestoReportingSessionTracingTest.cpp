@@ -95,7 +95,7 @@ TEST_F(SessionTracing, IsSetUpFromAParametersFileWithoutBeingStarted)
     EXPECT_FALSE(session->startedTracing());
     EXPECT_EQ(tracesStarted(), 0U);
     EXPECT_THAT(lines(), ElementsAre(IsLine(Info, "kerr", "Setting up tracing for test")));
-    EXPECT_EQ(lines()[0].file, "KestoReportingSession");
+    EXPECT_EQ(lines()[0].name, "KestoReportingSession");
 }
 
 TEST_F(SessionTracing, IsNotSetUpWithoutAFileWhichIsSaid)

@@ -132,7 +132,7 @@ TEST_F(SummaryFile, IsInADirectoryForEverybody)
                 ElementsAre(IsLine(Info, "kerr",
                                    "jsonOutput writeToURL: /diagnostics/Audio/Reporting/"
                                    "20260101-000000+0000-kesto-org.player-longformaudio.json")));
-    EXPECT_EQ(platform.log.lines()[0].file, "KestoReportingSession");
+    EXPECT_EQ(platform.log.lines()[0].name, "KestoReportingSession");
 }
 
 TEST_F(SummaryFile, TakesThePlaceOfAnEarlierOneOfTheSameSecond)

@@ -430,7 +430,8 @@ TEST_F(VolumeMessages, SayInTheLogWhatTheyAddAndSkip)
                             line("returning volume message { func=" + function + ", action=return, count=2 }")));
     for (const auto& each : platform.log.lines()) {
         EXPECT_EQ(each.subsystem, "com.quarn.kesto");
-        EXPECT_EQ(each.file, "KestoReportingSession");
+        EXPECT_EQ(each.name, "KestoReportingSession");
+        EXPECT_EQ(each.file, "KestoReportingSessionVolume.cpp");
     }
 }
 

@@ -39,7 +39,8 @@ void FakeLog::write(const platform::LogRecord& record)
                  std::string(record.message),
                  std::string(record.category.subsystem()),
                  std::string(record.location.file),
-                 record.location.line};
+                 record.location.line,
+                 std::string(record.location.name)};
     if (observer_)
         observer_(line);
     const foundation::Lock lock(lock_);

@@ -20,6 +20,7 @@ struct LogLine {
     std::string subsystem;
     std::string file; // of the statement
     int line;
+    std::string name; // what the prefix shows for the file
 };
 void PrintTo(const LogLine& line, std::ostream* out);
 

@@ -93,7 +93,7 @@ TEST_F(SingleThreadInterval, IsMeasuredFromTheSecondOfTwoStartsAndTheFirstIsDisc
 {
     EXPECT_THAT(process({begin(10), begin(20), end(50)}), ElementsAre(30));
     EXPECT_THAT(platform.log.lines(), ElementsAre(starts(Debug, 1)));
-    EXPECT_EQ(platform.log.lines()[0].file, "TraceInterval");
+    EXPECT_EQ(platform.log.lines()[0].name, "TraceInterval");
 }
 
 TEST_F(SingleThreadInterval, DiscardsAStopWithoutAStartOnItsThreadAndSaysHowManyStartsWere)

@@ -119,7 +119,7 @@ TEST_F(TraceParamsFile, HoldsATraceWithItsPointsInOrder)
     EXPECT_THAT(lines(),
                 ElementsAre(Says(Info, "Loading tracepoint : 553910272 and 553910276 \n finished parsing."),
                             Says(Info, "Loading tracepoint : 553910280 and 553910284 \n finished parsing.")));
-    EXPECT_THAT(lines(), Each(Field(&support::LogLine::file, "TraceParamsParser")));
+    EXPECT_THAT(lines(), Each(Field(&support::LogLine::name, "TraceParamsParser")));
 }
 
 TEST_F(TraceParamsFile, WithTwoTracesIsOneRecordUnderTheNameOfTheFirst)

@@ -11,7 +11,9 @@ using support::IsLine;
 using support::measurement;
 using testing::AllOf;
 using testing::Contains;
+using testing::Each;
 using testing::ElementsAre;
+using testing::Field;
 using testing::IsEmpty;
 using testing::Pair;
 using testing::SizeIs;
@@ -51,8 +53,10 @@ TEST_F(RunnerResults, AreWrittenInTheOrderInWhichTheyWereMeasuredAndSummedUpInTh
                             IsLine(Info, "kert", "Completed trace.... 1,   1 "),
                             IsLine(Info, "kert", "Completed trace....In write perf data.... 1"),
                             IsLine(Info, "kert", "Writing out 3 result for mix, min: 3, max: 9 ")));
-    for (const support::LogLine& line : platform.log.lines())
-        EXPECT_EQ(line.file, "TraceRunner");
+    const auto lines = platform.log.lines();
+    EXPECT_THAT(lines, Each(Field(&support::LogLine::name, "TraceRunner")));
+    EXPECT_EQ(lines.front().file, "TraceRunner.cpp");
+    EXPECT_EQ(lines.back().file, "TraceRunnerResults.cpp");
 }
 
 TEST_F(RunnerResults, OfEachTraceAreOrderedByName)

@@ -44,7 +44,7 @@ TEST_F(Runner, MakesNoTraceWithoutParametersAndSaysSo)
     runner->createTraceFromTraceParams(nullptr);
     EXPECT_EQ(runner->getNumTraces(), 0U);
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Default, "kert", "Attempted to add nullptr to trace runner")));
-    EXPECT_EQ(platform.log.lines()[0].file, "TraceRunner");
+    EXPECT_EQ(platform.log.lines()[0].name, "TraceRunner");
 }
 
 TEST_F(Runner, MakesAnIntervalOfEveryPointWhateverItsType)

@@ -25,7 +25,7 @@ public:
         template <std::convertible_to<std::string_view> Text>
         consteval Format(const Text& given, std::source_location where = std::source_location::current())
             : text(given),
-              location{baseName(where.file_name()), static_cast<int>(where.line())}
+              location(where.file_name(), static_cast<int>(where.line()))
         {
         }
         fmt::format_string<Arguments...> text;

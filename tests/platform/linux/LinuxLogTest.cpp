@@ -29,7 +29,7 @@ LogCategory category{"com.quarn.kesto", "kerr"};
 
 LogRecord record(std::string_view message, LogLevel level = LogLevel::Default)
 {
-    return {category, level, {"KestoReportingSession", 42}, message};
+    return {category, level, {"/a/KestoReportingSessionVolume.cpp", 42, "KestoReportingSession"}, message};
 }
 
 constexpr std::string_view prefix = "    KestoReportingSession:42    ";
@@ -195,7 +195,7 @@ TEST_F(LinuxLogJournalTest, SendsTheFieldsInTheNativeProtocol)
                           "SUBSYSTEM=com.quarn.kesto\n"
                           "CATEGORY=kerr\n"
                           "PRIORITY=5\n"
-                          "CODE_FILE=KestoReportingSession\n"
+                          "CODE_FILE=KestoReportingSessionVolume.cpp\n"
                           "CODE_LINE=42\n"
                           "SYSLOG_IDENTIFIER={}\n",
                           prefix, program_invocation_short_name));
