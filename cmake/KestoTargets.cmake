@@ -8,10 +8,12 @@ set(CMAKE_C_STANDARD 11)
 set(CMAKE_EXPORT_COMPILE_COMMANDS ON)
 set(CMAKE_POSITION_INDEPENDENT_CODE ON)
 
+# ccache hashes a precompiled header's bytes; only with these settings does it keep what was made with one.
 find_program(KESTO_CCACHE ccache)
 if(KESTO_CCACHE)
-  set(CMAKE_CXX_COMPILER_LAUNCHER ${KESTO_CCACHE})
-  set(CMAKE_C_COMPILER_LAUNCHER ${KESTO_CCACHE})
+  set(overlooked CCACHE_SLOPPINESS=pch_defines,time_macros,include_file_mtime,include_file_ctime)
+  set(CMAKE_CXX_COMPILER_LAUNCHER ${CMAKE_COMMAND} -E env ${overlooked} ${KESTO_CCACHE})
+  set(CMAKE_C_COMPILER_LAUNCHER ${CMAKE_CXX_COMPILER_LAUNCHER})
 endif()
 
 # Locks are annotated; clang proves that what they guard is only touched while they are held.
@@ -46,11 +48,23 @@ function(kesto_layer name)
   target_link_libraries(kesto_${name} PUBLIC ${arg_USES} PRIVATE ${arg_PRIVATE_USES})
 endfunction()
 
+# kesto_test_headers: the headers of the test libraries, compiled once for all test programs. A precompiled header serves
+# only what is compiled with the same options, so these are public: position-independent, with the same macros.
+function(kesto_make_test_headers)
+  file(CONFIGURE OUTPUT test_headers.cpp CONTENT "// A target needs a source: this one has only headers.\n")
+  add_library(kesto_test_headers STATIC ${CMAKE_CURRENT_BINARY_DIR}/test_headers.cpp)
+  target_link_libraries(kesto_test_headers PUBLIC GTest::gmock GTest::gtest rapidcheck_gtest fmt::fmt)
+  target_compile_definitions(kesto_test_headers PUBLIC _REENTRANT)
+  target_compile_options(kesto_test_headers PUBLIC -fPIC $<$<CXX_COMPILER_ID:GNU>:-fpch-preprocess>)
+  target_precompile_headers(kesto_test_headers PRIVATE <gmock/gmock.h> <gtest/gtest.h> <rapidcheck/gtest.h>)
+endfunction()
+
 # kesto_test(NAME SOURCES file... USES target...): one GoogleTest program, each of its tests a ctest.
 function(kesto_test name)
   cmake_parse_arguments(PARSE_ARGV 1 arg "" "" "SOURCES;USES")
   add_executable(${name} ${arg_SOURCES})
   target_include_directories(${name} PRIVATE ${PROJECT_SOURCE_DIR}/tests)
-  target_link_libraries(${name} PRIVATE ${arg_USES} GTest::gmock GTest::gtest_main)
+  target_link_libraries(${name} PRIVATE ${arg_USES} kesto_test_headers GTest::gtest_main)
+  target_precompile_headers(${name} REUSE_FROM kesto_test_headers)
   gtest_discover_tests(${name} DISCOVERY_TIMEOUT 60 PROPERTIES TIMEOUT 120)
 endfunction()

@@ -19,33 +19,8 @@ namespace support {
 // One at a time. Whatever uses the platform is declared after it, so that it goes first.
 class TestPlatform {
 public:
-    TestPlatform()
-    {
-        platform::install({.log = log,
-                           .clock = clock,
-                           .workQueues = workQueues,
-                           .preferences = preferences,
-                           .featureFlags = featureFlags,
-                           .deviceProperties = deviceProperties,
-                           .processTable = processTable,
-                           .notifications = notifications,
-                           .analytics = analytics,
-                           .traceMarkers = traceMarkers,
-                           .reportingChannels = reportingChannels,
-                           .bugCapture = bugCapture,
-                           .kernelTrace = kernelTrace,
-                           .performanceWriter = performanceWriter,
-                           .fileSystem = fileSystem});
-    }
-
-    ~TestPlatform()
-    {
-        // What waits here may hold sessions, and those say farewell to the platform.
-        workQueues.discardAll();
-        analytics.clear();
-        platform::uninstall();
-    }
-
+    TestPlatform();
+    ~TestPlatform();
     TestPlatform(const TestPlatform&) = delete;
     TestPlatform& operator=(const TestPlatform&) = delete;
 

@@ -1,0 +1,33 @@
+// In a file of its own, so that the fakes are compiled once and not for every test that installs them.
+#include "support/TestPlatform.h"
+
+namespace support {
+
+TestPlatform::TestPlatform()
+{
+    platform::install({.log = log,
+                       .clock = clock,
+                       .workQueues = workQueues,
+                       .preferences = preferences,
+                       .featureFlags = featureFlags,
+                       .deviceProperties = deviceProperties,
+                       .processTable = processTable,
+                       .notifications = notifications,
+                       .analytics = analytics,
+                       .traceMarkers = traceMarkers,
+                       .reportingChannels = reportingChannels,
+                       .bugCapture = bugCapture,
+                       .kernelTrace = kernelTrace,
+                       .performanceWriter = performanceWriter,
+                       .fileSystem = fileSystem});
+}
+
+TestPlatform::~TestPlatform()
+{
+    // What waits here may hold sessions, and those say farewell to the platform.
+    workQueues.discardAll();
+    analytics.clear();
+    platform::uninstall();
+}
+
+} // namespace support
