@@ -1,5 +1,5 @@
 // Property lists: the files in which people and programs describe things as dictionaries of dictionaries, written as
-// XML or in a binary form.
+// XML, in UTF-8 or UTF-16, or in a binary form.
 //
 // Such files come from anybody. So everything that a file can make grow has a limit, nothing that it names is fetched,
 // and what is not exactly a property list is refused, with the place where it stops to be one.

@@ -28,23 +28,6 @@ std::uint64_t bigEndian(std::string_view bytes) noexcept
     return value;
 }
 
-std::optional<std::string> utf8FromUtf16(std::string_view bytes)
-{
-    const auto unitAt = [bytes](std::size_t at) { return static_cast<std::uint32_t>(bigEndian(bytes.substr(at, 2))); };
-    std::string text;
-    for (std::size_t at = 0; at < bytes.size(); at += 2) {
-        std::uint32_t character = unitAt(at);
-        const bool isFirstOfPair = (character & 0xFC00) == 0xD800;
-        if (isFirstOfPair && at + 2 < bytes.size() && (unitAt(at + 2) & 0xFC00) == 0xDC00) {
-            at += 2;
-            character = 0x10000 + ((character & 0x3FF) << 10 | (unitAt(at) & 0x3FF));
-        }
-        if (!appendUtf8(character, text))
-            return std::nullopt;
-    }
-    return text;
-}
-
 class BinaryPropertyListReader : private PropertyListReader {
 public:
     BinaryPropertyListReader(std::string_view bytes, const PropertyListLimits& limits)
@@ -229,7 +212,7 @@ private:
 
     Value readUtf16(Object& object, unsigned detail)
     {
-        const auto text = utf8FromUtf16(take(object, takeCount(object, detail), sizeof(char16_t)));
+        const auto text = utf8FromUtf16(take(object, takeCount(object, detail), sizeof(char16_t)), std::endian::big);
         return text ? makeLeaf(object, String(*text)) : fail(object, InvalidText, "a string that is not in UTF-16");
     }
 

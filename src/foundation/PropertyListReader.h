@@ -4,6 +4,7 @@
 
 #include "foundation/PropertyList.h"
 
+#include <bit>
 #include <limits>
 #include <optional>
 #include <utility>
@@ -55,6 +56,8 @@ inline Number propertyListInteger(std::uint64_t value) noexcept
 
 // False, and nothing appended, for what is no Unicode character.
 [[nodiscard]] bool appendUtf8(std::uint32_t character, std::string& out);
+// Nothing for what is not well-formed. A byte order mark is a character like any other.
+[[nodiscard]] std::optional<std::string> utf8FromUtf16(std::string_view bytes, std::endian order);
 
 [[nodiscard]] std::expected<Value, PropertyListFailure> readXmlPropertyList(std::string_view bytes,
                                                                             const PropertyListLimits& limits);

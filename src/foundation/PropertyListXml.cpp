@@ -2,7 +2,7 @@
 //
 // It skips the document type without looking into it, and leaves references as they stand: the five that XML has and
 // numbers of characters are resolved here, any other is refused. So a document says nothing that is not in it, and
-// yields no more text than it has bytes.
+// yields no more text than it has bytes in UTF-8.
 #include "foundation/Format.h"
 #include "foundation/PropertyListReader.h"
 
@@ -155,7 +155,7 @@ public:
     {
         // pugixml takes a NUL for the end and does not look at what characters are made of.
         if (!isValidUtf8(bytes_) || bytes_.contains('\0'))
-            return outcome(failWith(InvalidText, "the file is no text in UTF-8"));
+            return outcome(failWith(InvalidText, "the file is no text in UTF-8 or UTF-16"));
         pugi::xml_document document;
         // With the blanks of texts, and with texts outside of the document's element: those are refused here.
         constexpr unsigned options = pugi::parse_cdata | pugi::parse_eol | pugi::parse_ws_pcdata | pugi::parse_fragment;

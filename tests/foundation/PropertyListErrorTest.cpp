@@ -18,6 +18,7 @@ using support::bigEndian;
 using support::binaryHead;
 using support::BinaryPropertyList;
 using support::binaryPropertyList;
+using support::utf16Bytes;
 using support::xmlDocument;
 using support::xmlPropertyList;
 using enum PropertyListError;
@@ -70,7 +71,7 @@ TEST(PropertyListErrors, NeitherForm)
 {
     expectFailure("Children", Malformed, "line 1: text where only elements can stand");
     expectFailure("{ Children = (); }", Malformed, "line 1: text where only elements can stand");
-    expectFailure(std::string(4, '\0'), InvalidText, "the file is no text in UTF-8");
+    expectFailure(std::string(4, '\0'), InvalidText, "the file is no text in UTF-8 or UTF-16");
     expectFailure("bplis", Malformed, "line 1: text where only elements can stand");
     expectFailure("bplist10" + std::string(40, '\0'), Unsupported, "header: a binary property list of another version");
 }
@@ -137,14 +138,35 @@ TEST(XmlPropertyListErrors, ElementsInsideOfText)
         expectXmlFailure(element, Malformed, "an element where only text can stand");
 }
 
+TEST(XmlPropertyListErrors, NotUtf16)
+{
+    const auto expectNoText = [](std::string_view bytes) {
+        expectFailure(bytes, InvalidText, "the file is no text in UTF-8 or UTF-16");
+    };
+    for (const auto order : {std::endian::big, std::endian::little}) {
+        const std::string list = utf16Bytes("<plist><true/></plist>", order);
+        EXPECT_TRUE(readPropertyList(list));
+        expectNoText(list + '>'); // half a unit
+        expectNoText(list + utf16Bytes("a", order).insert(0, 2, '\xD8')); // half a character
+        expectNoText(list + std::string(2, '\0'));
+        expectNoText(utf16Bytes(" <plist><true/></plist>", order)); // no mark, and no sign of its order
+    }
+    expectNoText(std::string_view("\xFF\xFE\0\0<\0\0\0", 8)); // UTF-32
+}
+
+TEST(XmlPropertyListErrors, TheLineIsToldInUtf16AsWell)
+{
+    const std::string list = "<plist>\n<dict>\n<key>a</key>\n<integer>x</integer>\n</dict>\n</plist>";
+    expectFailure(utf16Bytes("\uFEFF" + list, std::endian::little), InvalidValue, "line 4: not an integer of 64 bits");
+}
+
 TEST(XmlPropertyListErrors, NotUtf8)
 {
-    expectFailure(xmlDocument("<string>\xFF</string>"), InvalidText, "the file is no text in UTF-8");
-    expectFailure(xmlDocument("<string>\xED\xA0\x80</string>"), InvalidText, "the file is no text in UTF-8");
+    expectFailure(xmlDocument("<string>\xFF</string>"), InvalidText, "the file is no text in UTF-8 or UTF-16");
+    expectFailure(xmlDocument("<string>\xED\xA0\x80</string>"), InvalidText, "the file is no text in UTF-8 or UTF-16");
     expectFailure(xmlDocument(std::string_view("<string>a\0b</string>", 20)), InvalidText,
-                  "the file is no text in UTF-8");
-    expectFailure(xmlDocument("<true/>") + '\0', InvalidText, "the file is no text in UTF-8");
-    expectFailure(std::string_view("\xFE\xFF\0<", 4), InvalidText, "the file is no text in UTF-8");
+                  "the file is no text in UTF-8 or UTF-16");
+    expectFailure(xmlDocument("<true/>") + '\0', InvalidText, "the file is no text in UTF-8 or UTF-16");
 }
 
 TEST(XmlPropertyListErrors, ReferencesToNoCharacter)

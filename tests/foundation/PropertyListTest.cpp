@@ -16,6 +16,7 @@ namespace {
 
 using support::binaryPropertyList;
 using support::BinaryPropertyList;
+using support::utf16Bytes;
 using support::xmlDocument;
 using support::xmlPropertyList;
 
@@ -285,6 +286,15 @@ TEST(XmlPropertyList, MayBeginWithAByteOrderMarkAndWithoutADeclaration)
 {
     EXPECT_EQ(read("\xEF\xBB\xBF<plist><true/></plist>"), Value(true));
     EXPECT_EQ(read("\n <plist><true/></plist> \n"), Value(true));
+}
+
+TEST(XmlPropertyList, MayBeInUtf16OfEitherOrder)
+{
+    const std::string list = R"(<?xml version="1.0" encoding="UTF-16"?><plist><string>a&lt;é€😀</string></plist>)";
+    for (const auto order : {std::endian::big, std::endian::little}) {
+        EXPECT_EQ(read(utf16Bytes("\uFEFF" + list, order)), Value("a<é€😀"));
+        EXPECT_EQ(read(utf16Bytes(list, order)), Value("a<é€😀")) << "without a byte order mark";
+    }
 }
 
 TEST(XmlPropertyList, TheDocumentTypeIsNotLookedInto)

@@ -75,6 +75,18 @@ inline std::u16string utf16(std::string_view text)
     return units;
 }
 
+// The same as bytes of that order.
+inline std::string utf16Bytes(std::string_view text, std::endian order)
+{
+    std::string bytes;
+    for (const char16_t unit : utf16(text)) {
+        const char high = static_cast<char>(unit >> 8);
+        const char low = static_cast<char>(unit & 0xFF);
+        bytes += order == std::endian::big ? std::string{high, low} : std::string{low, high};
+    }
+    return bytes;
+}
+
 // Every value an object of its own, containers behind their elements.
 class BinaryPropertyListWriter {
 public:
