@@ -5,6 +5,7 @@
 #include "platform/linux/LinuxPlatform.h"
 #include "platform/linux/ServiceManager.h"
 #include "service/KestoReportingServiceDelegate.h"
+#include "tracing/TraceRunner.h"
 #include "utility/KestoReportingLogCategories.h"
 
 #include <csignal>
@@ -52,6 +53,7 @@ int run()
 
     platform::LinuxPlatform platform(*launch);
     platform::install(platform.platform());
+    platform.removeUnfinished(KestoReportingTracingLogsDirectory());
     (*listener)->setTraceAccess(platform.traceMarkerAccess());
     const auto service = KestoReportingServiceDelegate::make();
     (*listener)->setDelegate(*service);

@@ -163,5 +163,18 @@ TEST(LaunchTest, ADatabaseThatIsNoneIsPutAsideAndAnotherBegun)
     EXPECT_THAT(kestod.log(), HasSubstr("analytics.sqlite3.corrupt-"));
 }
 
+TEST(LaunchTest, RemovesTheResultsThatAKilledServiceHadBegunToWrite)
+{
+    Kestod kestod;
+    const auto folder = kestod.directory() / "logs/Audio/Traces";
+    std::filesystem::create_directories(folder);
+    support::writeFile(folder / ".kestod-0123456789abcdef.tmp", "{\"project\":");
+    support::writeFile(folder / "tracing_results.qdj", "{}");
+    kestod.start();
+    WireClient(kestod.socketPath()).ask(GetAllReporters);
+    EXPECT_FALSE(std::filesystem::exists(folder / ".kestod-0123456789abcdef.tmp"));
+    EXPECT_TRUE(std::filesystem::exists(folder / "tracing_results.qdj"));
+}
+
 } // namespace
 } // namespace end_to_end

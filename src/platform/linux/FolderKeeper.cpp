@@ -59,13 +59,13 @@ void FolderKeeper::added(const std::filesystem::path& folder, const KeptFiles& k
 void FolderKeeper::look(const std::filesystem::path& folder, const KeptFiles& kept, const Open& open)
 {
     const auto opened = open();
-    const auto files = opened ? filesIn(opened->get(), kept) : std::unexpected(opened.error());
+    const auto files = opened ? filesIn(opened->get(), kept.isOne) : std::unexpected(opened.error());
     Contents staying;
     if (files) {
         std::vector<std::uint64_t> sizes;
         std::ranges::transform(*files, std::back_inserter(sizes), &File::bytes);
         const std::size_t going = howManyGo(sizes, kept);
-        remove(std::span(*files).first(going), opened->get(), folder, kept);
+        removeOldest(std::span(*files).first(going), opened->get(), folder, kept);
         staying = {sizes.size() - going,
                    std::accumulate(sizes.begin() + static_cast<std::ptrdiff_t>(going), sizes.end(), std::uint64_t{0})};
     } else {
@@ -78,8 +78,21 @@ void FolderKeeper::look(const std::filesystem::path& folder, const KeptFiles& ke
     account.isLookedThrough = false;
 }
 
+void FolderKeeper::removeUnfinished(const std::filesystem::path& folder, int opened)
+{
+    const auto files = filesIn(opened, isTemporaryName);
+    const Removal removal = files ? remove(*files, opened) : Removal{.reason = files.error()};
+    if (removal.removed != 0)
+        log_.note("removed {} files from {} that a service which was killed had begun to write", removal.removed,
+                  folder.native());
+    if (removal.reason)
+        log_.error("what a service which was killed had begun to write in {} cannot be removed ({})", folder.native(),
+                   removal.reason.message());
+}
+
 // The files of that kind, the oldest first; among them what a killed service had begun to write.
-std::expected<std::vector<FolderKeeper::File>, std::error_code> FolderKeeper::filesIn(int folder, const KeptFiles& kept)
+std::expected<std::vector<FolderKeeper::File>, std::error_code>
+FolderKeeper::filesIn(int folder, bool (*isOne)(std::string_view name))
 {
     auto names = namesIn(folder, mostNames);
     if (!names)
@@ -87,9 +100,8 @@ std::expected<std::vector<FolderKeeper::File>, std::error_code> FolderKeeper::fi
     std::vector<File> files;
     for (std::string& name : *names) {
         struct stat status = {};
-        if ((kept.isOne(name) || isTemporaryName(name))
-            && ::fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(status.st_mode)
-            && status.st_uid == ::geteuid())
+        if ((isOne(name) || isTemporaryName(name)) && ::fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0
+            && S_ISREG(status.st_mode) && status.st_uid == ::geteuid())
             files.push_back({{status.st_mtim.tv_sec, status.st_mtim.tv_nsec},
                              std::move(name),
                              static_cast<std::uint64_t>(status.st_size)});
@@ -100,26 +112,31 @@ std::expected<std::vector<FolderKeeper::File>, std::error_code> FolderKeeper::fi
     return files;
 }
 
-void FolderKeeper::remove(std::span<const File> files, int folder, const std::filesystem::path& path,
-                          const KeptFiles& kept)
+FolderKeeper::Removal FolderKeeper::remove(std::span<const File> files, int folder)
 {
-    std::size_t removed = 0;
-    std::size_t staying = 0;
-    std::error_code reason;
+    Removal removal;
     for (const File& file : files) {
         if (::unlinkat(folder, file.name.c_str(), 0) == 0) {
-            ++removed;
+            ++removal.removed;
         } else if (errno != ENOENT) {
-            ++staying;
-            reason = {errno, std::generic_category()};
+            ++removal.staying;
+            removal.reason = {errno, std::generic_category()};
         }
     }
-    removedFiles_ += removed;
-    if (removed != 0)
+    return removal;
+}
+
+void FolderKeeper::removeOldest(std::span<const File> files, int folder, const std::filesystem::path& path,
+                                const KeptFiles& kept)
+{
+    const Removal removal = remove(files, folder);
+    removedFiles_ += removal.removed;
+    if (removal.removed != 0)
         log_.note("removed the oldest {} files from {}, {} since the start: there may be {} of {} MiB together",
-                  removed, path.native(), removedFiles(), kept.most, kept.mostBytes >> 20);
-    if (staying != 0)
-        log_.error("{} of the oldest files cannot be removed from {} ({})", staying, path.native(), reason.message());
+                  removal.removed, path.native(), removedFiles(), kept.most, kept.mostBytes >> 20);
+    if (removal.staying != 0)
+        log_.error("{} of the oldest files cannot be removed from {} ({})", removal.staying, path.native(),
+                   removal.reason.message());
 }
 
 } // namespace platform

@@ -33,7 +33,11 @@ public:
     // that removes files says so in the log, in one line.
     void added(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes, Open open);
 
-    // Since the start.
+    // Removes what a process that was killed had begun to write in the folder that is open, and says so in the log. Not
+    // while anybody writes there.
+    void removeUnfinished(const std::filesystem::path& folder, int opened);
+
+    // Since the start, of the oldest.
     [[nodiscard]] std::uint64_t removedFiles() const noexcept { return removedFiles_; }
 
 private:
@@ -50,8 +54,16 @@ private:
 
     // The background queue.
     void look(const std::filesystem::path& folder, const KeptFiles& kept, const Open& open);
-    [[nodiscard]] static std::expected<std::vector<File>, std::error_code> filesIn(int folder, const KeptFiles& kept);
-    void remove(std::span<const File> files, int folder, const std::filesystem::path& path, const KeptFiles& kept);
+    struct Removal {
+        std::size_t removed = 0;
+        std::size_t staying = 0;
+        std::error_code reason; // of the last one that stays
+    };
+    [[nodiscard]] static std::expected<std::vector<File>, std::error_code>
+    filesIn(int folder, bool (*isOne)(std::string_view name));
+    [[nodiscard]] static Removal remove(std::span<const File> files, int folder);
+    void removeOldest(std::span<const File> files, int folder, const std::filesystem::path& path,
+                      const KeptFiles& kept);
 
     WorkQueues& workQueues_;
     const ProviderLog log_;

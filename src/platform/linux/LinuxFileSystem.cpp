@@ -135,6 +135,13 @@ void LinuxFileSystem::keepWithin(const std::filesystem::path& folder, const Kept
         keeper_->added(folder, kept, bytes, [this, folder] { return openDirectory(folder, std::nullopt); });
 }
 
+void LinuxFileSystem::removeUnfinished(const std::filesystem::path& folder)
+{
+    const auto opened = openDirectory(folder, std::nullopt);
+    if (opened && keeper_ != nullptr)
+        keeper_->removeUnfinished(folder, opened->get());
+}
+
 std::expected<std::string, std::error_code> LinuxFileSystem::readFile(const std::filesystem::path& path,
                                                                       std::size_t limit)
 {

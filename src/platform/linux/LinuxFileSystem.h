@@ -40,6 +40,10 @@ public:
     [[nodiscard]] std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,
                                                                        std::size_t limit) override;
 
+    // For the start, before anything is written: removes what a service that was killed had begun to write in the
+    // folder. A folder that is missing is as good as an empty one.
+    void removeUnfinished(const std::filesystem::path& folder);
+
 private:
     // Steps down from the root, and makes the folders on the way that are missing, if there are permissions for them.
     [[nodiscard]] std::expected<FileDescriptor, std::error_code>

@@ -38,6 +38,8 @@ public:
     [[nodiscard]] Platform platform();
     // What the bundle does not show: how many events were kept and lost, and a way to write all that were sent.
     [[nodiscard]] AnalyticsStore& analyticsStore() noexcept { return analytics_; }
+    // For the start: see LinuxFileSystem.
+    void removeUnfinished(const std::filesystem::path& folder) { fileSystem_.removeUnfinished(folder); }
     // What the listener hands out to clients.
     [[nodiscard]] TraceMarkerAccess& traceMarkerAccess() noexcept { return traceMarkerAccess_; }
 

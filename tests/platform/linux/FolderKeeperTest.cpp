@@ -188,6 +188,33 @@ TEST_F(FolderKeeper, RemovesWhatAKilledServiceHadBegunToWrite)
     EXPECT_THAT(names(), ElementsAre("note-3", "note-4", "note-5", "note-6", "note-7", "note-8"));
 }
 
+TEST_F(FolderKeeper, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingElse)
+{
+    make(".kestod-0123456789abcdef.tmp", 0, 5000);
+    make(".kestod-fedcba9876543210.tmp", 1);
+    make(".kestod-0123456789abcdef.tmp.old", 0);
+    make("note-1", 0);
+    fs::create_directories(folder / ".kestod-00000000000000aa.tmp");
+    fs::create_symlink(folder / "note-1", folder / ".kestod-00000000000000bb.tmp");
+    files.removeUnfinished(folder);
+    EXPECT_THAT(names(),
+                ElementsAre(".kestod-00000000000000aa.tmp", ".kestod-00000000000000bb.tmp",
+                            ".kestod-0123456789abcdef.tmp.old", "note-1"));
+    EXPECT_THAT(log.lines(),
+                ElementsAre(IsLine(Default, "kerl",
+                                   "removed 2 files from " + folder.string()
+                                       + " that a service which was killed had begun to write")));
+}
+
+TEST_F(FolderKeeper, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissing)
+{
+    make("note-1", 0);
+    files.removeUnfinished(folder);
+    files.removeUnfinished(root / "Audio/Missing");
+    EXPECT_THAT(names(), ElementsAre("note-1"));
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
 TEST_F(FolderKeeper, DoesNotLookThroughALink)
 {
     for (int number = 1; number <= 8; ++number)
