@@ -47,6 +47,9 @@ public:
                                  std::function<void(const KernelTraceEvent&)> handler) = 0;
     virtual int start(std::shared_ptr<WorkQueue> queue) = 0;
     virtual void end() = 0;
+    // How many events were lost while it ran, of which some or all may not have been its own: known once it is
+    // complete, so ask in the completion handler.
+    [[nodiscard]] virtual std::uint64_t lostEvents() const = 0;
     [[nodiscard]] virtual std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const = 0;
 };
 

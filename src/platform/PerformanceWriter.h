@@ -1,6 +1,8 @@
 // The performance-data writer: one file of named measurements.
 #pragma once
 
+#include "foundation/Value.h"
+
 #include <cstdint>
 #include <filesystem>
 #include <memory>
@@ -15,6 +17,8 @@ class PerformanceFile {
 public:
     virtual ~PerformanceFile() = default;
     virtual void write(std::string_view name, double value, PerformanceUnit unit) = 0;
+    // Says something of all measurements together, such as how many of them are missing.
+    virtual void remark(std::string_view key, const foundation::Value& value) = 0;
 };
 
 // Any thread.

@@ -7,21 +7,20 @@ void Trace::processTracepoints(const platform::KernelTraceSession& session, std:
 {
     std::size_t results = 0;
     std::size_t eventsRead = 0;
-    std::size_t leftOut = 0;
     for (const auto& data : data_) {
         const bool isTooMuch = eventsRead != 0 && eventsRead + events.size() > mostEventsRead;
         if (results >= mostResults || isTooMuch) {
-            ++leftOut;
+            ++intervalsLeftOut_;
             continue;
         }
         data->processTracepoints(session, events);
         results += data->getResults().size();
         eventsRead += events.size();
     }
-    if (leftOut != 0)
+    if (intervalsLeftOut_ != 0)
         KESTO_LOG(KestoReportingTraceCategory(), Error,
                   "trace {} has read {} events and has {} results; {} of its intervals are left out", name_, eventsRead,
-                  results, leftOut);
+                  results, intervalsLeftOut_);
 }
 
 TraceResults Trace::getResults()

@@ -28,12 +28,15 @@ public:
     static constexpr std::size_t mostResults = 1'000'000;
     static constexpr std::size_t mostEventsRead = 50'000'000;
     void processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events);
+    // How many were left out.
+    [[nodiscard]] std::size_t intervalsLeftOut() const { return intervalsLeftOut_; }
     // Everything that was found. What one call has gathered stays: the next returns every value once more.
     [[nodiscard]] TraceResults getResults();
 
 private:
     const std::string name_;
     const bool collectKernelTrace_;
+    std::size_t intervalsLeftOut_ = 0;
     TraceResults resultsByName_;
     std::vector<std::unique_ptr<TraceData>> data_;
 };

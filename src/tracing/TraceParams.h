@@ -31,6 +31,10 @@ inline constexpr std::string_view TracePointEventsMatchedBy = "EventsMatchedBy";
 inline constexpr std::string_view TracePointEventsMatchedByThread = "Thread";
 inline constexpr std::string_view TracePointEventsMatchedByProcess = "Process"; // as all but "Thread": any thread
 
+// The codes that are collected, those that clients emit for tracing; both ends belong to them.
+inline constexpr std::uint32_t firstTraceCode = 0x21040000;
+inline constexpr std::uint32_t lastTraceCode = 0x2104408A;
+
 // One point: the codes of the events that begin and end what it measures.
 struct TraceDataParams {
     static constexpr std::uint32_t impulse = 0;
@@ -52,6 +56,7 @@ struct TraceDataParams {
     std::uint32_t beginCode;
     std::uint32_t endCode;
     bool matchByThread; // whether both events must come from one thread
+    bool isTypeKnown = true; // else the point has the type and the codes of the one before
 
     friend bool operator==(const TraceDataParams&, const TraceDataParams&) = default;
 };
@@ -64,4 +69,8 @@ struct TraceParams {
     std::string name;
     std::int32_t traceType = kernelTrace;
     std::vector<TraceDataParams> traceDataParams; // in the order of the file
+    // The first thing that is wrong with the file, in the words of the log: it cannot be read, or something in it is of
+    // another kind than it should be. Empty when all was read.
+    std::string problem = {};
+    std::size_t leftOut = 0; // traces and points, for want of room
 };

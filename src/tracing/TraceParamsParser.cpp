@@ -96,46 +96,55 @@ std::uint32_t codeAt(const Dictionary& dictionary, std::string_view key)
 // One run of the parser.
 class Loading {
 public:
-    std::unique_ptr<TraceParams> load(const std::filesystem::path& path)
+    std::unique_ptr<TraceParams> load(const std::filesystem::path& path) { return interpret(readPropertyList(path)); }
+
+    std::unique_ptr<TraceParams> interpret(const Value& list)
     {
-        const Dictionary root = readPropertyList(path).dictionary().value_or(Dictionary());
+        const Dictionary root = list.dictionary().value_or(Dictionary());
         if (const auto traces = arrayAt(root, TraceParamChildrenNodes); !traces)
-            KESTO_LOG(KestoReportingTraceCategory(), Error, "Failed to load Trace Parameter Array with error: {}",
-                      traces.error());
+            fail(foundation::format("Failed to load Trace Parameter Array with error: {}", traces.error()));
         else
             loadEach(*traces, [this](const Value& trace) { loadTrace(trace); });
-        if (leftOut_ > 0)
+        if (params_->leftOut > 0)
             KESTO_LOG(KestoReportingTraceCategory(), Error,
-                      "Left out {} traces and trace points: no more than {} are read", leftOut_,
+                      "Left out {} traces and trace points: no more than {} are read", params_->leftOut,
                       TraceParamsParser::mostTracesAndPoints);
         return std::move(params_);
     }
 
 private:
-    static Value readPropertyList(const std::filesystem::path& path)
+    Value readPropertyList(const std::filesystem::path& path)
     {
         const auto bytes = platform::current().fileSystem.readFile(path, PropertyListLimits().bytes);
         if (!bytes)
-            logReadingFailed(bytes.error().message());
+            failReading(bytes.error().message());
         const auto read = foundation::readPropertyList(bytes ? *bytes : std::string_view());
         if (!read)
-            logReadingFailed(read.error().text);
+            failReading(read.error().text);
         Value value = read.value_or(Value());
         if (value.isNull())
-            KESTO_LOG(KestoReportingTraceCategory(), Error, "No valid input found in plist.");
+            fail("No valid input found in plist.");
         return value;
     }
 
-    static void logReadingFailed(std::string_view why)
+    void failReading(std::string_view why)
     {
-        KESTO_LOG(KestoReportingTraceCategory(), Error, "Reading from plist file failed with error: {}", why);
+        fail(foundation::format("Reading from plist file failed with error: {}", why));
+    }
+
+    // Of several problems the first is the one that explains the others.
+    void fail(std::string problem)
+    {
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "{}", problem);
+        if (params_->problem.empty())
+            params_->problem = std::move(problem);
     }
 
     template <typename Load> void loadEach(const Array& values, Load load)
     {
         for (const Value& value : values) {
             if (loaded_ == TraceParamsParser::mostTracesAndPoints) {
-                ++leftOut_;
+                ++params_->leftOut;
                 continue;
             }
             ++loaded_;
@@ -147,8 +156,7 @@ private:
     {
         const auto read = asDictionary(value);
         if (!read)
-            KESTO_LOG(KestoReportingTraceCategory(), Error, "Failed to load Trace Parameter dictionary with error : {}",
-                      read.error());
+            fail(foundation::format("Failed to load Trace Parameter dictionary with error : {}", read.error()));
         const Dictionary trace = read.value_or(Dictionary());
 
         if (params_->name.empty()) {
@@ -160,8 +168,8 @@ private:
             params_->traceType = TraceParams::signpostTrace; // and stays it
 
         if (const auto points = arrayAt(trace, TraceDataChildrenNodes); !points)
-            KESTO_LOG(KestoReportingTraceCategory(), Error,
-                      "Failed to read the Trace Points from the plist file with error: {}", points.error());
+            fail(foundation::format("Failed to read the Trace Points from the plist file with error: {}",
+                                    points.error()));
         else
             loadEach(*points, [this](const Value& point) { loadTracePoint(point); });
     }
@@ -170,18 +178,20 @@ private:
     {
         const auto read = asDictionary(value);
         if (!read)
-            KESTO_LOG(KestoReportingTraceCategory(), Error,
-                      "Failed to read Trace Point from Trace Points dictionary. Failed with error: {}", read.error());
+            fail(foundation::format("Failed to read Trace Point from Trace Points dictionary. Failed with error: {}",
+                                    read.error()));
         const Dictionary point = read.value_or(Dictionary());
 
         const bool byThread = textAt(point, TracePointEventsMatchedBy) == TracePointEventsMatchedByThread;
-        takeTypeAndCodes(point);
-        params_->traceDataParams.emplace_back(cStringAt(point, TracePointDescription), type_, begin_, end_, byThread);
+        const bool isTypeKnown = takeTypeAndCodes(point);
+        params_->traceDataParams.emplace_back(cStringAt(point, TracePointDescription), type_, begin_, end_, byThread)
+            .isTypeKnown = isTypeKnown;
         KESTO_LOG(KestoReportingTraceCategory(), Info, "Loading tracepoint : {} and {} \n finished parsing.",
                   static_cast<std::int32_t>(begin_), static_cast<std::int32_t>(end_));
     }
 
-    void takeTypeAndCodes(const Dictionary& point)
+    // Whether it is a type.
+    bool takeTypeAndCodes(const Dictionary& point)
     {
         const std::string type = textAt(point, TracePointType);
         if (type == TracePointTypeInterval) {
@@ -194,8 +204,11 @@ private:
         } else if (type == TracePointTypeLevel) {
             type_ = TraceDataParams::level;
             begin_ = codeAt(point, TracePointBeginCode);
-        } else
+        } else {
             KESTO_LOG(KestoReportingTraceCategory(), Error, "TracePointType field not recognized or is empty.");
+            return false;
+        }
+        return true;
     }
 
     std::unique_ptr<TraceParams> params_ = std::make_unique<TraceParams>();
@@ -203,7 +216,6 @@ private:
     std::uint32_t begin_ = 0;
     std::uint32_t end_ = 0;
     std::size_t loaded_ = 0; // traces and points
-    std::size_t leftOut_ = 0;
 };
 
 } // namespace
@@ -212,4 +224,9 @@ std::unique_ptr<TraceParams> TraceParamsParser::loadTraceParams() const
 {
     std::error_code unknown; // where the current directory is gone, nothing is found below it
     return Loading().load(std::filesystem::current_path(unknown) / traceParamsFile_);
+}
+
+std::unique_ptr<TraceParams> TraceParamsParser::paramsOf(const foundation::Value& root)
+{
+    return Loading().interpret(root);
 }

@@ -4,6 +4,7 @@
 // wrong shape. Nothing of that ends the reading: what is wrong is logged and counts as empty, and the rest is read.
 #pragma once
 
+#include "foundation/Value.h"
 #include "tracing/TraceParams.h"
 
 #include <cstddef>
@@ -22,6 +23,8 @@ public:
     // What the file says, never null: without name and points when it says nothing. Does not wait for whatever stands
     // at the path, and takes no more memory than a file within the limits of property lists.
     [[nodiscard]] std::unique_ptr<TraceParams> loadTraceParams() const;
+    // What a property list says that was read already. Any thread; needs no platform, without which it logs nothing.
+    [[nodiscard]] static std::unique_ptr<TraceParams> paramsOf(const foundation::Value& root);
 
     // Traces and points of a file, taken together. Those beyond are left out, with a line that says how many.
     static constexpr std::size_t mostTracesAndPoints = 1024;

@@ -1,6 +1,7 @@
 // A trace's way: set up, started, ended, completed.
 #include "tracing/TraceRunner.h"
 
+#include "foundation/Format.h"
 #include "platform/Platform.h"
 #include "tracing/TraceParams.h"
 #include "utility/KestoReportingLogCategories.h"
@@ -9,10 +10,6 @@
 #include <cassert>
 
 namespace {
-
-// The codes that clients emit for tracing; both ends belong to them.
-constexpr std::uint32_t firstCode = 0x21040000;
-constexpr std::uint32_t lastCode = 0x2104408A;
 
 constinit std::atomic<std::size_t> runners{0};
 
@@ -42,6 +39,8 @@ void TraceRunner::createTraceFromTraceParams(const TraceParams* params)
         KESTO_LOG(KestoReportingTraceCategory(), Default, "Attempted to add nullptr to trace runner");
         return;
     }
+    lostPoints_ += params->leftOut;
+    keepProblem(params->problem);
     auto trace = std::make_unique<Trace>(params->name, params->traceType == TraceParams::kernelTrace);
     for (const auto& point : params->traceDataParams)
         trace->addTraceDataToCollect(
@@ -68,8 +67,7 @@ void TraceRunner::setupTracing(Trace& trace)
 {
     auto session = platform::current().kernelTrace.createTraceSession();
     if (!session) {
-        KESTO_LOG(KestoReportingTraceCategory(), Error, "there is no kernel trace; {} collects no events",
-                  trace.name());
+        fail(foundation::format("there is no kernel trace; {} collects no events", trace.name()));
         return;
     }
     session->setCompletionHandler([this, &trace] { tracingCompletionHandler(trace); });
@@ -83,10 +81,22 @@ void TraceRunner::startTracing(Trace& trace)
     if (session == traceSessions_.end())
         return;
     const auto append = [events = traceEvents_.at(&trace)](const trace_point& event) { events->append(event); };
-    if (const int error = session->second->filterEventRange(firstCode, lastCode, append); error != 0)
-        KESTO_LOG(KestoReportingTraceCategory(), Error, "Could not set up ktrace range, error: {}", error);
+    if (const int error = session->second->filterEventRange(firstTraceCode, lastTraceCode, append); error != 0)
+        fail(foundation::format("Could not set up ktrace range, error: {}", error));
     if (const int error = session->second->start(tracingQueue_); error != 0)
-        KESTO_LOG(KestoReportingTraceCategory(), Error, "Could not start ktrace session, error: {}", error);
+        fail(foundation::format("Could not start ktrace session, error: {}", error));
+}
+
+void TraceRunner::fail(std::string problem)
+{
+    KESTO_LOG(KestoReportingTraceCategory(), Error, "{}", problem);
+    keepProblem(std::move(problem));
+}
+
+void TraceRunner::keepProblem(std::string problem)
+{
+    if (problem_.empty())
+        problem_ = std::move(problem);
 }
 
 void TraceRunner::stopTracingandProcessResults()
@@ -138,6 +148,8 @@ void TraceRunner::processEvents(Trace& trace)
         KESTO_LOG(KestoReportingTraceCategory(), Error, "trace {} lost {} events for want of memory", trace.name(),
                   events.lost());
     trace.processTracepoints(*session->second, events.all());
+    lostEvents_ += session->second->lostEvents() + events.lost();
+    lostIntervals_ += trace.intervalsLeftOut();
 }
 
 void TraceRunner::tearDownTracing(Trace& trace)

@@ -62,8 +62,11 @@ private:
     void tracingCompletionHandler(Trace& trace);
     void tearDownTracing(Trace& trace);
     void processEvents(Trace& trace);
+    void fail(std::string problem);
+    void keepProblem(std::string problem);
 
     void writeQuilldat();
+    void remarkWhatIsMissing();
     static void printTraceResults(const TraceWithResults& results);
 
     const std::uint32_t resultsVersion_ = 4;
@@ -75,5 +78,12 @@ private:
     // Shared with the handler that fills it, which may outlive the session by an event.
     std::map<const Trace*, std::shared_ptr<TraceEvents>> traceEvents_;
     std::map<const Trace*, TraceResults> traceResults_;
+
+    // What is missing in the results. While the traces run it is the tracing queue's.
+    std::uint64_t lostEvents_ = 0; // at most
+    std::size_t lostIntervals_ = 0; // that were not measured
+    std::size_t lostPoints_ = 0; // of the parameters, with traces, that were not read
+    std::string problem_; // the first, with the parameters or with a start; empty: none
+
     std::map<const Trace*, std::unique_ptr<platform::KernelTraceSession>> traceSessions_; // go first
 };

@@ -34,7 +34,18 @@ void TraceRunner::writeQuilldat()
             for (const std::uint64_t value : values)
                 perfWriter_->write(name, static_cast<double>(value), platform::PerformanceUnit::Nanoseconds);
     }
+    remarkWhatIsMissing();
     perfWriter_.reset();
+}
+
+// Whoever reads the file looks here before believing what is in it.
+void TraceRunner::remarkWhatIsMissing()
+{
+    perfWriter_->remark("lostEvents", lostEvents_);
+    perfWriter_->remark("lostIntervals", lostIntervals_);
+    perfWriter_->remark("lostPoints", lostPoints_);
+    if (!problem_.empty())
+        perfWriter_->remark("problem", problem_);
 }
 
 void TraceRunner::printTraceResults(const TraceWithResults& results)

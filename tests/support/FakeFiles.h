@@ -95,6 +95,7 @@ public:
         std::string project;
         std::uint32_t version = 0;
         std::vector<Measurement> measurements;
+        std::map<std::string, foundation::Value, std::less<>> remarks;
         bool closed = false;
     };
 
@@ -123,6 +124,10 @@ private:
         void write(std::string_view name, double value, platform::PerformanceUnit unit) override
         {
             file_->measurements.push_back({std::string(name), value, unit});
+        }
+        void remark(std::string_view key, const foundation::Value& value) override
+        {
+            file_->remarks.insert_or_assign(std::string(key), value);
         }
 
     private:

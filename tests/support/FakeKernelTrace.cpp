@@ -36,6 +36,7 @@ public:
         if (session_->queue && session_->completion && service_.completes)
             session_->queue->submit(session_->completion);
     }
+    [[nodiscard]] std::uint64_t lostEvents() const override { return service_.lost; }
     [[nodiscard]] std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const override
     {
         return service_.toNanoseconds ? service_.toNanoseconds(timestamp) : timestamp;

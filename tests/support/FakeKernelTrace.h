@@ -31,6 +31,8 @@ public:
     bool available = true;
     int filterError = 0;
     int startError = 0;
+    // What each session says that it has lost.
+    std::uint64_t lost = 0;
     // Whether sessions are completed once they have ended, started or not.
     bool completes = true;
     // What a unit of time is; a nanosecond, unless it is set.

@@ -45,6 +45,12 @@ Dictionary file(const Value& traces)
     return {{"Children", traces}};
 }
 
+TraceDataParams ofUnknownType(TraceDataParams point)
+{
+    point.isTypeKnown = false;
+    return point;
+}
+
 class TraceParamsFile : public testing::Test {
 protected:
     static constexpr std::string_view path = "/traces.plist";
@@ -239,7 +245,37 @@ TEST_F(TraceParamsFile, HasNamesThatEndAtTheFirstNul)
     EXPECT_THAT(errors(), ElementsAre(Says(Error, "Description not found in the plist file")));
 }
 
+TEST_F(TraceParamsFile, IsUnderstoodAlsoWithoutAPlatform)
+{
+    platform::uninstall();
+    const auto params =
+        TraceParamsParser::paramsOf(file(Array{trace("A", Array{point("a", "Interval", "1", "2")}), 7}));
+    EXPECT_THAT(params->traceDataParams, ElementsAre(TraceDataParams("a", 1, 1, 2, false)));
+    EXPECT_EQ(params->problem,
+              "Failed to load Trace Parameter dictionary with error : it is a number, not a dictionary");
+}
+
 // --- what is wrong with the file
+
+TEST_F(TraceParamsFile, NamesTheFirstThingThatIsWrongWithIt)
+{
+    const auto problem = [this](const Value& root) { return read(root).problem; };
+    EXPECT_EQ(TraceParamsParser("/missing").loadTraceParams()->problem,
+              "Reading from plist file failed with error: No such file or directory");
+    EXPECT_EQ(load("<plist>")->problem,
+              "Reading from plist file failed with error: line 1: not well-formed XML: Start-end tags mismatch");
+    EXPECT_EQ(load(support::binaryPropertyList(Value()))->problem, "No valid input found in plist.");
+    EXPECT_EQ(problem(Array()), "Failed to load Trace Parameter Array with error: " + missing);
+    EXPECT_EQ(problem(file(Array{trace("A", Array{point("a", "", "")}), "B"})),
+              "Failed to load Trace Parameter dictionary with error : it is a string, not a dictionary");
+    EXPECT_EQ(problem(file(Array{trace("A", "x"), "B"})),
+              "Failed to read the Trace Points from the plist file with error: \"Children\" holds a string, not an "
+              "array");
+    EXPECT_EQ(problem(file(Array{trace("A", Array{1})})),
+              "Failed to read Trace Point from Trace Points dictionary. Failed with error: it is a number, not a "
+              "dictionary");
+    EXPECT_EQ(problem(file(Array{trace("", Array{point("a", "", "")})})), "") << "what can be read all the same";
+}
 
 TEST_F(TraceParamsFile, IsTakenFromTheCurrentDirectoryUnlessItsPathIsAbsolute)
 {
@@ -363,8 +399,8 @@ TEST_F(TraceParamsFile, WithAPointOfUnknownTypeHoldsItWithWhatThePointBeforeHad)
     EXPECT_THAT(
         readPoints({point("first", "interval", "8", "9"), point("a", "Interval", "1", "2"),
                     point("b", "Signpost", "3", "4").with("EventsMatchedBy", "Thread"), Dictionary{{"Name", "c"}}}),
-        ElementsAre(TraceDataParams("first", 0, 0, 0, false), TraceDataParams("a", 1, 1, 2, false),
-                    TraceDataParams("b", 1, 1, 2, true), TraceDataParams("c", 1, 1, 2, false)));
+        ElementsAre(ofUnknownType({"first", 0, 0, 0, false}), TraceDataParams("a", 1, 1, 2, false),
+                    ofUnknownType({"b", 1, 1, 2, true}), ofUnknownType({"c", 1, 1, 2, false})));
     EXPECT_THAT(lines(),
                 ElementsAre(Says(Error, "TracePointType field not recognized or is empty."),
                             Says(Info, "Loading tracepoint : 0 and 0 \n finished parsing."),
@@ -378,7 +414,7 @@ TEST_F(TraceParamsFile, WithAPointOfUnknownTypeHoldsItWithWhatThePointBeforeHad)
 TEST_F(TraceParamsFile, WithAPointThatIsNoDictionaryHoldsOneWithoutAName)
 {
     EXPECT_THAT(readPoints({point("a", "Interval", "1", "2"), "b"}),
-                ElementsAre(TraceDataParams("a", 1, 1, 2, false), TraceDataParams("", 1, 1, 2, false)));
+                ElementsAre(TraceDataParams("a", 1, 1, 2, false), ofUnknownType({"", 1, 1, 2, false})));
     EXPECT_THAT(lines(),
                 ElementsAre(Says(Info, "Loading tracepoint : 1 and 2 \n finished parsing."),
                             Says(Error,
@@ -394,11 +430,12 @@ TEST_F(TraceParamsFile, LeavesOutTracesAndPointsBeyondTheMost)
     const auto pointsRead = [this](std::size_t points, std::size_t furtherTraces) {
         std::vector<Value> traces(furtherTraces, trace("further", Array()));
         traces.insert(traces.begin(), trace("T", Array(std::vector<Value>(points, point("p", "Level", "1")))));
-        return read(file(Array(traces))).traceDataParams.size();
+        const TraceParams params = read(file(Array(traces)));
+        return std::pair(params.traceDataParams.size(), params.leftOut);
     };
-    EXPECT_EQ(pointsRead(most - 1, 0), most - 1);
+    EXPECT_EQ(pointsRead(most - 1, 0), std::pair(most - 1, 0UZ));
     EXPECT_THAT(errors(), IsEmpty());
-    EXPECT_EQ(pointsRead(most + 1, 5), most - 1);
+    EXPECT_EQ(pointsRead(most + 1, 5), std::pair(most - 1, 7UZ));
     EXPECT_THAT(errors(), ElementsAre(Says(Error, "Left out 7 traces and trace points: no more than 1024 are read")));
 }
 

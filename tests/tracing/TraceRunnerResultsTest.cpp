@@ -59,6 +59,73 @@ TEST_F(RunnerResults, AreWrittenInTheOrderInWhichTheyWereMeasuredAndSummedUpInTh
     EXPECT_EQ(lines.back().file, "TraceRunnerResults.cpp");
 }
 
+// --- what is missing in them
+
+using Remarks = std::map<std::string, foundation::Value, std::less<>>;
+
+TEST_F(RunnerResults, SayThatNothingIsMissing)
+{
+    trace({5});
+    EXPECT_EQ(file().remarks, (Remarks{{"lostEvents", 0}, {"lostIntervals", 0}, {"lostPoints", 0}}));
+}
+
+TEST_F(RunnerResults, SayHowManyEventsTheTracesLost)
+{
+    platform.kernelTrace.lost = 1000;
+    add(interval("one", "first"));
+    add(interval("two", "second"));
+    runner->runTraces();
+    emit(5);
+    runner->stopTracingandProcessResults();
+    EXPECT_EQ(file().remarks, (Remarks{{"lostEvents", 2000}, {"lostIntervals", 0}, {"lostPoints", 0}}));
+}
+
+TEST_F(RunnerResults, SayHowManyIntervalsWereNotMeasured)
+{
+    TraceParams params = interval("trace", "mix");
+    params.traceDataParams.resize(600, params.traceDataParams.front());
+    add(params);
+    runner->runTraces();
+    for (int count = 0; count < 50'000; ++count)
+        emit(1);
+    runner->stopTracingandProcessResults();
+    // Each has 50,000 results, and reads 100,000 events.
+    EXPECT_EQ(file().remarks, (Remarks{{"lostEvents", 0}, {"lostIntervals", 580}, {"lostPoints", 0}}));
+}
+
+TEST_F(RunnerResults, SayWhatOfTheParametersWasNotRead)
+{
+    TraceParams params = interval("trace", "mix");
+    params.leftOut = 7;
+    params.problem = "Reading from plist file failed with error: Permission denied";
+    add(params);
+    platform.kernelTrace.startError = 24;
+    runner->runTraces();
+    runner->stopTracingandProcessResults();
+    EXPECT_EQ(file().remarks,
+              (Remarks{{"lostEvents", 0},
+                       {"lostIntervals", 0},
+                       {"lostPoints", 7},
+                       {"problem", "Reading from plist file failed with error: Permission denied"}}));
+}
+
+TEST_F(RunnerResults, SayWhyATraceCouldNotBeRun)
+{
+    const auto problemOf = [this](std::string name) {
+        runner = std::make_unique<TraceRunner>();
+        add(interval(std::move(name), "mix"));
+        runner->runTraces();
+        runner->stopTracingandProcessResults();
+        return platform.performanceWriter.files().back()->remarks["problem"];
+    };
+    platform.kernelTrace.startError = 24;
+    EXPECT_EQ(problemOf("one"), foundation::Value("Could not start ktrace session, error: 24"));
+    platform.kernelTrace.filterError = 22;
+    EXPECT_EQ(problemOf("two"), foundation::Value("Could not set up ktrace range, error: 22"));
+    platform.kernelTrace.available = false;
+    EXPECT_EQ(problemOf("three"), foundation::Value("there is no kernel trace; three collects no events"));
+}
+
 TEST_F(RunnerResults, OfEachTraceAreOrderedByName)
 {
     add({.name = "trace",

@@ -48,6 +48,7 @@ private:
             return 0;
         }
         void end() override { hasEnded_ = true; }
+        [[nodiscard]] std::uint64_t lostEvents() const override { return 0; }
         [[nodiscard]] std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const override { return timestamp; }
 
     private:

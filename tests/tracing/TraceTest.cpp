@@ -94,6 +94,7 @@ TEST_F(TraceTest, LetsEachReadAllEventsAndListsTheirResultsByName)
     process({eventOf(1, 10), eventOf(2, 15), eventOf(3, 17), eventOf(1, 20), eventOf(2, 21), eventOf(3, 28)});
     EXPECT_THAT(trace.data(), SizeIs(2));
     EXPECT_THAT(trace.getResults(), ElementsAre(Pair("capture", ElementsAre(7, 8)), Pair("render", ElementsAre(5, 1))));
+    EXPECT_EQ(trace.intervalsLeftOut(), 0U);
 }
 
 TEST_F(TraceTest, ListsTheResultsOfEqualNamesInTheOrderInWhichTheyWereAdded)
@@ -131,6 +132,7 @@ TEST_F(TraceTest, LeavesOutWhatItWouldMeasureBeyondAMillionResultsAndSaysSo)
             events.push_back(event);
     process(events);
     EXPECT_THAT(trace.getResults(), ElementsAre(Pair("0", SizeIs(each)), Pair("1", SizeIs(each))));
+    EXPECT_EQ(trace.intervalsLeftOut(), 3U);
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(support::IsLine(platform::LogLevel::Error, "kert",
                                             "trace startup has read 2000000 events and has 1000000 results; 3 of its "
@@ -144,6 +146,7 @@ TEST_F(TraceTest, LeavesOutIntervalsThatWouldReadMoreEventsThanTheServiceMayWait
     for (std::size_t number = 0; number < read + 2; ++number)
         add(std::to_string(number), 1, 2);
     process(Events(count, eventOf(3, 1)));
+    EXPECT_EQ(trace.intervalsLeftOut(), 2U);
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(support::IsLine(platform::LogLevel::Error, "kert",
                                             "trace startup has read 50000000 events and has 0 results; 2 of its "

@@ -37,8 +37,8 @@ public:
     }
     ~LinuxPerformanceFile() override
     {
-        text_ += "\n]}\n";
-        file_->write(text_);
+        remark("lostValues", lost_);
+        file_->write(text_ + "\n]" + remarks_ + "}\n");
         if (lost_ != 0)
             log_.error("{} has become too large; {} records are lost", path_.native(), lost_);
         if (const auto written = file_->commit(); !written)
@@ -71,6 +71,12 @@ public:
         }
     }
 
+    void remark(std::string_view key, const foundation::Value& value) override
+    {
+        remarks_.append(",").append(jsonText(key)).append(":");
+        (void)foundation::appendJson(value, remarks_);
+    }
+
 private:
     // Values of one name come in a row.
     void rememberName(std::string_view name)
@@ -89,6 +95,7 @@ private:
     std::size_t room_; // bytes that records may still take
     std::uint64_t lost_ = 0;
     std::string text_; // not written yet
+    std::string remarks_;
     std::string name_;
     std::string nameText_; // as it stands in the file
     bool isFirst_ = true;

@@ -3,9 +3,10 @@
 //     {"project":"KestoReporting","version":4,"records":[
 //     {"name":"mix","value":187250,"unit":"ns"},
 //     {"name":"mix","value":190125,"unit":"ns"}
-//     ]}
+//     ],"lostEvents":0,"lostValues":0}
 //
-// A record stands in a line of its own and says all that there is to know about it. The file takes its place when it is
+// A record stands in a line of its own and says all that there is to know about it. Remarks stand behind them, where
+// all is known: the last one is how many records there was no room for. The file takes its place when it is
 // complete: whoever reads it sees the last one or this one, and never half of it.
 #pragma once
 

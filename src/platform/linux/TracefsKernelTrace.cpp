@@ -83,6 +83,7 @@ public:
             trace_.end(subscription_);
     }
 
+    [[nodiscard]] std::uint64_t lostEvents() const override { return subscription_->lost; }
     [[nodiscard]] std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const override { return timestamp; }
 
 private:

@@ -46,7 +46,7 @@ TEST_F(PerformanceWriter, WritesADocumentWithOneRecordALine)
 {"name":"mix","value":187250,"unit":"ns"},
 {"name":"mix","value":0.5,"unit":"ns"},
 {"name":"render","value":1.8446744073709552e+19,"unit":"ns"}
-]}
+],"lostValues":0}
 )");
     EXPECT_THAT(log.lines(), IsEmpty());
 }
@@ -54,7 +54,20 @@ TEST_F(PerformanceWriter, WritesADocumentWithOneRecordALine)
 TEST_F(PerformanceWriter, WritesADocumentWithoutRecordsToo)
 {
     open().reset();
-    EXPECT_EQ(readFile(path), "{\"project\":\"KestoReporting\",\"version\":4,\"records\":[\n]}\n");
+    EXPECT_EQ(readFile(path), "{\"project\":\"KestoReporting\",\"version\":4,\"records\":[\n],\"lostValues\":0}\n");
+}
+
+TEST_F(PerformanceWriter, WritesRemarksBehindTheRecords)
+{
+    auto file = open();
+    file->remark("lostEvents", std::uint64_t{1840});
+    file->write("mix", 1, PerformanceUnit::Nanoseconds);
+    file->remark("problem", "\"a\"");
+    file.reset();
+    EXPECT_EQ(readFile(path), R"({"project":"KestoReporting","version":4,"records":[
+{"name":"mix","value":1,"unit":"ns"}
+],"lostEvents":1840,"problem":"\"a\"","lostValues":0}
+)");
 }
 
 TEST_F(PerformanceWriter, WritesNamesAsJsonText)
@@ -68,7 +81,7 @@ TEST_F(PerformanceWriter, WritesNamesAsJsonText)
 {"name":"","value":1,"unit":"ns"},
 {"name":"a \"b\"\\\n\u0001","value":2,"unit":"ns"},
 {"name":"é","value":3,"unit":"ns"}
-]}
+],"lostValues":0}
 )");
 }
 
@@ -81,7 +94,7 @@ TEST_F(PerformanceWriter, WritesNullForWhatIsNoNumberInJson)
     EXPECT_EQ(readFile(path), R"({"project":"KestoReporting","version":4,"records":[
 {"name":"a","value":null,"unit":"ns"},
 {"name":"a","value":null,"unit":"ns"}
-]}
+],"lostValues":0}
 )");
 }
 
@@ -96,7 +109,7 @@ TEST_F(PerformanceWriter, WritesEveryRecordOfALargeFile)
             + R"(,"unit":"ns"})";
     }
     file.reset();
-    EXPECT_TRUE(readFile(path) == expected + "\n]}\n");
+    EXPECT_TRUE(readFile(path) == expected + "\n],\"lostValues\":0}\n");
 }
 
 TEST_F(PerformanceWriter, LosesRecordsThatWouldMakeTheFileTooLargeAndSaysHowMany)
@@ -110,7 +123,7 @@ TEST_F(PerformanceWriter, LosesRecordsThatWouldMakeTheFileTooLargeAndSaysHowMany
     file.reset();
     EXPECT_EQ(readFile(path), R"({"project":"p","version":1,"records":[
 {"name":"b","value":2,"unit":"ns"}
-]}
+],"lostValues":2}
 )");
     EXPECT_THAT(log.lines(),
                 ElementsAre(IsLine(Error, "kerl", path.string() + " has become too large; 2 records are lost")));

@@ -197,6 +197,23 @@ TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
     EXPECT_NEAR(timeOfDay(first), day, clockTolerance);
 }
 
+TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
+{
+    Listener listener(trace);
+    ASSERT_EQ(listener.start(), 0);
+    tree.put(0, TracePageBuilder(1000).event(now(), firstCode).missed(1840).page());
+    ASSERT_TRUE(listener.waitForEvents(1));
+    listener.end();
+    ASSERT_TRUE(listener.waitForCompletion());
+    EXPECT_EQ(listener.session->lostEvents(), 1840U);
+
+    Listener next(trace);
+    ASSERT_EQ(next.start(), 0);
+    next.end();
+    ASSERT_TRUE(next.waitForCompletion());
+    EXPECT_EQ(next.session->lostEvents(), 0U) << "what others lost before";
+}
+
 TEST_F(TracefsKernelTraceTest, TellsNoTimeOfDayToWhoDoesNotWantIt)
 {
     Listener listener(trace, false);
