@@ -8,8 +8,10 @@
 #include <csignal>
 #include <fcntl.h>
 #include <gtest/gtest.h>
+#include <sched.h>
 #include <sqlite3.h>
 #include <stdexcept>
+#include <sys/mount.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -77,6 +79,9 @@ void Kestod::start(const InheritedDescriptors& inherited)
     const fs::path logPath = directory() / "log";
     process_ = ::fork();
     if (process_ == 0) {
+        if (!hidden_.empty()
+            && (::unshare(CLONE_NEWNS) != 0 || ::mount("none", hidden_.c_str(), "tmpfs", 0, nullptr) != 0))
+            ::_exit(127);
         const int standardError = inherited.standardError >= 0
             ? inherited.standardError
             : ::open(logPath.c_str(), O_WRONLY | O_CREAT | O_APPEND, 0600);

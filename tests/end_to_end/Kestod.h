@@ -58,6 +58,10 @@ public:
     Kestod(const Kestod&) = delete;
     Kestod& operator=(const Kestod&) = delete;
 
+    // From the next start on the process finds this folder empty, as a unit with PrivateTmp= or ProtectHome= has it
+    // find others'. Takes a right to mount.
+    void hide(const std::filesystem::path& folder) { hidden_ = folder; }
+
     // Starts the process; clients that connect at once wait for it.
     void start(const InheritedDescriptors& inherited = {});
     // The same, for clients that do not wait: returns when the service listens.
@@ -86,6 +90,7 @@ private:
 
     const support::TemporaryDirectory directory_;
     Environment environment_;
+    std::filesystem::path hidden_; // empty: none
     pid_t process_ = 0;
 };
 

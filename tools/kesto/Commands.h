@@ -6,10 +6,11 @@
 #include <CLI/Config.hpp>
 #include <CLI/Formatter.hpp>
 
-// Exit statuses; a wrong command line is 2.
+// Exit statuses; a wrong command line is 2, and 3 that something is missing in what is shown.
 constexpr int exitOk = 0;
 constexpr int exitFailure = 1;
 constexpr int exitUsage = 2;
+constexpr int exitIncomplete = 3;
 
 // That one of the subcommands must be chosen. A word that names none is then told, and not that there is none.
 void requireSubcommand(CLI::App& application);

@@ -1,6 +1,7 @@
 // The new file lies on the disk as a whole before it takes the name, so that losing power leaves one or the other.
 #include "Replacement.h"
 
+#include "OutputFile.h"
 #include "platform/linux/FileDescriptor.h"
 
 #include <cerrno>
@@ -21,18 +22,6 @@ std::runtime_error systemError(std::string_view what, const fs::path& path, int 
 {
     return std::runtime_error(
         fmt::format("cannot {} {}: {}", what, path.native(), std::generic_category().message(error)));
-}
-
-bool writeAll(int file, std::string_view text)
-{
-    while (!text.empty()) {
-        const ssize_t count = ::write(file, text.data(), text.size());
-        if (count >= 0)
-            text.remove_prefix(static_cast<std::size_t>(count));
-        else if (errno != EINTR)
-            return false;
-    }
-    return true;
 }
 
 // The owner stays another's where only root may change that.

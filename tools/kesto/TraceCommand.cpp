@@ -1,5 +1,6 @@
 // `kesto trace`: shows what a trace has measured, or runs a program while a trace measures it.
 #include "Commands.h"
+#include "InputFile.h"
 #include "TraceRecording.h"
 #include "TraceView.h"
 
@@ -38,7 +39,8 @@ CLI::App* addRecordCommand(CLI::App& trace, TraceOptions& options)
     command->prefix_command(); // its arguments are not this tool's
     command->footer(R"(Measures a program in one line:
   kesto trace record --params mixer.plist -- ./mixer -t 10
-Exit status: that of the program; 1 if nothing could be recorded, 127 if it could not be run.)");
+Exit status: that of the program; instead of 0, 3 if something is missing in the results. 1 if nothing could be
+recorded, 127 if the program could not be run.)");
     return command;
 }
 
@@ -64,8 +66,8 @@ void addTraceCommand(CLI::App& application, int& exitStatus)
             options->recording.command = commandOf(*record, options->program);
             exitStatus = recordTrace(options->recording);
         } else {
-            showTraceResults(options->file, options->isJson);
-            exitStatus = exitOk;
+            const auto results = traceResultsOf(readInput(options->file, largestTraceResults), options->file);
+            exitStatus = showTraceResults(results, options->isJson);
         }
     });
 }

@@ -1,32 +1,24 @@
-// That the service traces shows three times: a start is answered at once, a client that asked for it may emit events,
-// and a new results file takes the place of the old one. Whoever is refused on the way is told where to look.
+// Nothing is run before it is known that it can be measured: the service first traces for a moment, and what it writes
+// then tells whether it reads the parameters, where its results come, and whether they can be read.
 #include "TraceRecording.h"
 
 #include "Commands.h"
-#include "InputFile.h"
+#include "OutputFile.h"
 #include "Places.h"
 #include "Terminal.h"
+#include "TraceParametersFile.h"
+#include "TraceResultsPlace.h"
 #include "TraceView.h"
-#include "foundation/PropertyList.h"
-#include "platform/linux/FileDescriptor.h"
+#include "TracedSession.h"
 
 #include <cerrno>
-#include <chrono>
-#include <condition_variable>
 #include <csignal>
-#include <cstdint>
 #include <cstdio>
 #include <cstdlib>
-#include <fcntl.h>
 #include <fmt/format.h>
-#include <functional>
-#include <kesto/trace.hpp>
-#include <mutex>
 #include <optional>
-#include <random>
 #include <spawn.h>
 #include <stdexcept>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <system_error>
 #include <unistd.h>
@@ -35,171 +27,48 @@ namespace {
 
 namespace fs = std::filesystem;
 
-template <typename... Arguments> [[noreturn]] void fail(fmt::format_string<Arguments...> text, Arguments&&... arguments)
-{
-    throw std::runtime_error(fmt::format(text, std::forward<Arguments>(arguments)...));
-}
-
-std::string errorText(int error)
-{
-    return std::generic_category().message(error);
-}
-
-// The service goes on with whatever it finds; an engineer wants to know before.
-void checkParameters(const fs::path& path)
-{
-    const std::string text = readInput(path, foundation::PropertyListLimits().bytes);
-    if (const auto list = foundation::readPropertyList(text); !list)
-        fail("{} is no parameters file: {}", printable(path.native()), printable(list.error().text));
-}
-
-// The results file that is there now. It is kept open: so no file that comes later can be taken for it.
-class LastResults {
-public:
-    explicit LastResults(fs::path path) : path_(std::move(path)), file_(::open(path_.c_str(), O_PATH | O_CLOEXEC)) { }
-
-    [[nodiscard]] const fs::path& path() const { return path_; }
-    [[nodiscard]] bool areReplaced() const
-    {
-        struct stat before = {};
-        struct stat now = {};
-        if (::stat(path_.c_str(), &now) != 0)
-            return false;
-        return !file_ || ::fstat(file_.get(), &before) != 0 || before.st_dev != now.st_dev
-            || before.st_ino != now.st_ino;
-    }
-
-private:
-    const fs::path path_;
-    const platform::FileDescriptor file_;
+// Where the service writes, and from where on others may, too.
+struct ResultsFolder {
+    fs::path root;
+    fs::path path;
 };
 
-// A session of the service that traces from `start` to `stop`; it ends with its connection at the latest.
-class TracedSession {
-public:
-    explicit TracedSession(const std::string& socket)
-    {
-        kesto::Options options;
-        options.socketPath = socket;
-        options.wakeOnSend = true;
-        options.trace = true;
-        options.stateChanged = [this](const kesto::StateChange& change) { stateChanged(change); };
-        if (const auto status = client_.open(options); status != kesto::Status::Ok)
-            fail("the service cannot be reached: {}", kesto::errorText(status));
+ResultsFolder folderOf(const TraceRecordingOptions& options)
+{
+    if (!options.results.empty())
+        return {.root = fs::absolute(options.results).parent_path(),
+                .path = fs::absolute(options.results).parent_path()};
+    return {.root = usualLogsDirectory(), .path = usualLogsDirectory() / "Audio/Traces"};
+}
+
+// What the service says is wrong when it traces for a moment with the parameters that it finds at that path.
+std::string problemWith(const fs::path& parameters, TracedSession& session, TraceResultsPlace& results)
+{
+    session.start(parameters);
+    session.stop();
+    return traceResultsOf(results.takeNew(), results.path()).problem;
+}
+
+// Begins the trace. What is wrong in the file itself was told before; what the service says beyond that ends it.
+void start(TracedSession& session, const TraceParametersFile& file, TraceResultsPlace& results,
+           const ResultsFolder& folder)
+{
+    const std::string problem = problemWith(file.path, session, results);
+    if (problem == file.params.problem)
+        return session.start(file.path);
+    std::optional<TraceParametersCopy> copy;
+    try {
+        copy.emplace(folder.root, folder.path, file.text);
+    } catch (const std::runtime_error& error) {
+        throw std::runtime_error(
+            fmt::format("the service does not measure by {}: {}; and it cannot be given a copy: {}",
+                        printable(file.path.native()), printable(problem), error.what()));
     }
-
-    void start(const fs::path& parameters)
-    {
-        // The kind of trace is left out: the service knows one, and takes no client's word for it.
-        kesto::Message configuration;
-        configuration.add("KestoReportingPellorinPlistFilePath", parameters.native());
-        ask([&](const auto& answered) { return client_.createSession(reporter_, answered); });
-        ask([&](const auto& answered) {
-            return client_.setServiceType(kesto::ServiceType::Test, reporter_, answered);
-        });
-        ask([&](const auto& answered) { return client_.setConfiguration(configuration, reporter_, answered); });
-        // Where the service may trace, a start is answered before the next call; else it is answered when it ends.
-        if (const auto status = client_.startSession(reporter_, [this](const auto& answer) { takeStart(answer); });
-            status != kesto::Status::Ok)
-            fail("the session cannot be started: {}", kesto::errorText(status));
-        ask([&](const auto& answered) { return client_.validate(reporter_, answered); });
-        {
-            const std::scoped_lock lock(lock_);
-            if (!mayBeTraced_)
-                fail("the service does not trace. Either the feature is off (feature-flags.toml: [Sonalis] Tracing = "
-                     "true), or there is no tracefs that it may use: its log says so");
-        }
-        waitForTrace();
-    }
-
-    // When it returns, the service has written the results, if it could.
-    void stop()
-    {
-        ask([&](const auto& answered) { return client_.stopSession(reporter_, answered); });
-    }
-
-private:
-    using Call = std::function<kesto::Status(const kesto::AnswerCallback& answered)>;
-
-    static constexpr std::chrono::seconds patience{30}; // until an answer
-    static constexpr std::chrono::seconds tracePatience{2}; // until a trace that was started is seen here
-
-    static kesto::ReporterID randomReporter()
-    {
-        std::random_device random;
-        return std::uniform_int_distribution<kesto::ReporterID>(1)(random);
-    }
-
-    void ask(const Call& call)
-    {
-        {
-            const std::scoped_lock lock(lock_);
-            isAnswered_ = false;
-        }
-        if (const auto status = call([this](const kesto::Answer& answer) { take(answer); });
-            status != kesto::Status::Ok && status != kesto::Status::NotConnected) // what is lost is told below
-            fail("the service cannot be asked: {}", kesto::errorText(status));
-        std::unique_lock lock(lock_);
-        if (!changed_.wait_for(lock, patience, [this] { return isAnswered_ || !problem_.empty(); }))
-            fail("the service does not answer within {} s", patience.count());
-        if (!problem_.empty())
-            throw std::runtime_error(problem_);
-    }
-
-    // On the library's thread, as what follows.
-    void take(const kesto::Answer& answer)
-    {
-        const std::scoped_lock lock(lock_);
-        if (answer.status() != kesto::Status::Ok)
-            return; // the library's, of a connection whose end is told apart
-        isAnswered_ = true;
-        if (!answer.ok())
-            problem_ = fmt::format("the service refuses: {} {}; is reporting disabled?",
-                                   printable(answer.errorDomain()), answer.errorCode());
-        changed_.notify_all();
-    }
-
-    void takeStart(const kesto::Answer& answer)
-    {
-        const std::scoped_lock lock(lock_);
-        mayBeTraced_ |= answer.ok();
-    }
-
-    void stateChanged(const kesto::StateChange& change)
-    {
-        if (change.state != kesto::State::Disconnected)
-            return;
-        const std::scoped_lock lock(lock_);
-        problem_ =
-            fmt::format("{}: {}{}; {}", change.socketPath, kesto::errorText(change.reason),
-                        change.systemError == 0 ? "" : " (" + errorText(change.systemError) + ")",
-                        change.reason == kesto::Status::ConnectionLost ? "its log says why" : "is kestod running?");
-        changed_.notify_all();
-    }
-
-    void waitForTrace()
-    {
-        const kesto::Tracer tracer(client_);
-        const auto end = std::chrono::steady_clock::now() + tracePatience;
-        std::unique_lock lock(lock_);
-        while (!tracer.isActive()) {
-            if (!problem_.empty())
-                throw std::runtime_error(problem_);
-            if (std::chrono::steady_clock::now() > end)
-                fail("the service has begun no trace: either the parameters file asks for none of the kernel, or too "
-                     "many run already; its log says which");
-            changed_.wait_for(lock, std::chrono::milliseconds(1)); // nobody tells when it begins
-        }
-    }
-
-    const kesto::ReporterID reporter_ = randomReporter();
-    std::mutex lock_;
-    std::condition_variable changed_;
-    bool isAnswered_ = false; // the last call
-    bool mayBeTraced_ = false;
-    std::string problem_;
-    kesto::Client client_; // ends first: its thread calls what is above
-};
+    if (const std::string other = problemWith(copy->path(), session, results); other != file.params.problem)
+        throw std::runtime_error(
+            fmt::format("the service does not measure by {}: {}", printable(file.path.native()), printable(other)));
+    session.start(copy->path()); // which it has read when this returns
+}
 
 // While a program runs in front, the keys that interrupt are for it: who waits for it goes on, as a shell does.
 class KeyboardSignals {
@@ -261,7 +130,8 @@ std::optional<int> run(const std::vector<std::string>& command)
     const KeyboardSignals signals;
     pid_t process = 0;
     if (const int error = spawn(command, signals, process); error != 0) {
-        fmt::print(stderr, "kesto: {} cannot be run: {}\n", printable(command.front()), errorText(error));
+        fmt::print(stderr, "kesto: {} cannot be run: {}\n", printable(command.front()),
+                   std::generic_category().message(error));
         return std::nullopt;
     }
     int status = 0;
@@ -269,14 +139,25 @@ std::optional<int> run(const std::vector<std::string>& command)
     return WIFEXITED(status) ? WEXITSTATUS(status) : signalled + WTERMSIG(status);
 }
 
-void showResults(const LastResults& results, const fs::path& output)
+void tell(const std::exception& exception)
 {
-    if (!results.areReplaced())
-        fail("the service has written no results to {}; if its log directory is another, name it with --results",
-             printable(results.path().native()));
-    if (!output.empty())
-        fs::copy_file(results.path(), output, fs::copy_options::overwrite_existing);
-    showTraceResults(output.empty() ? results.path() : output, false);
+    fmt::print(stderr, "kesto: {}\n", exception.what());
+}
+
+// The exit status, if the program's own is that all is well.
+int show(TraceResultsPlace& results, const fs::path& output)
+{
+    const std::string text = results.takeNew();
+    int status = exitOk;
+    try {
+        if (!output.empty())
+            writeOutput(output, text);
+    } catch (const std::exception& exception) { // what was measured is there to be seen all the same
+        tell(exception);
+        status = exitFailure;
+    }
+    const int shown = showTraceResults(traceResultsOf(text, results.path()), false);
+    return status == exitOk ? shown : status;
 }
 
 } // namespace
@@ -284,24 +165,24 @@ void showResults(const LastResults& results, const fs::path& output)
 int recordTrace(const TraceRecordingOptions& options)
 {
     constexpr int exitCannotRun = 127; // as shells have it
-    const fs::path parameters = fs::absolute(options.parameters); // the service has another directory
-    checkParameters(parameters);
-    const LastResults results(options.results.empty() ? usualLogsDirectory() / "Audio/Traces/tracing_results.qdj"
-                                                      : options.results);
+    const TraceParametersFile parameters = readTraceParameters(options.parameters);
+    for (const std::string& warning : warningsOf(parameters.params))
+        fmt::print(stderr, "kesto: warning: {}: {}\n", printable(parameters.path.native()), printable(warning));
+    const ResultsFolder folder = folderOf(options);
+    TraceResultsPlace results(options.results.empty() ? folder.path / "tracing_results.qdj" : options.results);
     if (!options.socket.empty())
         ::setenv("KESTO_SOCKET", options.socket.c_str(), 1); // before there are threads
     TracedSession session(options.socket);
-    session.start(parameters);
+    start(session, parameters, results, folder);
     const auto ended = run(options.command);
     if (!ended)
         return exitCannotRun;
-    const int status = *ended;
+    int status = exitFailure;
     try {
         session.stop();
-        showResults(results, options.output);
+        status = show(results, options.output);
     } catch (const std::exception& exception) {
-        fmt::print(stderr, "kesto: {}\n", exception.what());
-        return status == exitOk ? exitFailure : status;
+        tell(exception);
     }
-    return status;
+    return *ended == exitOk ? status : *ended;
 }

@@ -14,7 +14,8 @@ struct TraceRecordingOptions {
     std::vector<std::string> command; // the program and its arguments
 };
 
-// Runs the program while the service traces, with its socket in $KESTO_SOCKET if one is given; then prints what was
-// measured. Returns the program's exit status: 128 and the signal's number if one ended it, 127 if it could not be run,
-// 1 instead of 0 if there are no results. Throws std::runtime_error when no trace can be had, and does not run it then.
+// Warns of parameters that measure nothing; runs the program while the service traces, with its socket in $KESTO_SOCKET
+// if one is given; then prints what was measured. Returns the program's exit status: 128 and the signal's number if one
+// ended it, 127 if it could not be run; instead of 0, 1 if there are no results or no copy of them, and exitIncomplete
+// if something is missing in them. Throws std::runtime_error when no trace can be had, and does not run it then.
 [[nodiscard]] int recordTrace(const TraceRecordingOptions& options);

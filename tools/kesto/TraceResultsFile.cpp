@@ -122,7 +122,9 @@ private:
     {
         if (isInRecords_ && depth_ == inRecord && (key_ == "name" || key_ == "value" || key_ == "unit"))
             return wrongRecord();
-        if (depth_ == inDocument && (key_ == "project" || key_ == "version" || key_ == "records"))
+        if (depth_ == inDocument
+            && (key_ == "project" || key_ == "version" || key_ == "records" || key_ == "problem"
+                || lossAt(key_) != nullptr))
             return fail(fmt::format("its \"{}\" is of another kind", key_));
         return true;
     }
@@ -144,9 +146,25 @@ private:
             project_ = value.text;
         else if (key_ == "version" && value.kind == Kind::Number)
             version_ = value.number;
+        else if (key_ == "problem" && value.kind == Kind::Text)
+            file_.problem = value.text;
+        else if (double* const loss = lossAt(key_); loss != nullptr && value.kind == Kind::Number)
+            *loss = value.number;
         else
             return mayBeContainer(); // no member of the format, that is
         return true;
+    }
+
+    // Null for what is none.
+    double* lossAt(std::string_view key)
+    {
+        for (const auto& [name, loss] : {std::pair("lostEvents", &file_.lostEvents),
+                                         {"lostIntervals", &file_.lostIntervals},
+                                         {"lostPoints", &file_.lostPoints},
+                                         {"lostValues", &file_.lostValues}})
+            if (key == name)
+                return loss;
+        return nullptr;
     }
 
     bool recordMember(const Scalar& value)

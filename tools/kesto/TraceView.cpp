@@ -1,9 +1,8 @@
 // Times are shown in the unit that suits them, with four digits: enough to compare, few enough to read.
 #include "TraceView.h"
 
-#include "InputFile.h"
+#include "Commands.h"
 #include "Terminal.h"
-#include "TraceResultsFile.h"
 #include "TraceStatistics.h"
 #include "foundation/Json.h"
 
@@ -21,16 +20,23 @@ using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
 
-TraceResultsFile read(const std::filesystem::path& path)
+// A sentence each.
+std::vector<std::string> whatIsMissing(const TraceResultsFile& results)
 {
-    constexpr std::size_t largest = std::size_t{512} << 20; // twice what the service writes
-    auto results = parseTraceResults(readInput(path, largest));
-    if (!results)
-        throw std::runtime_error(
-            fmt::format("{} is no results file of a trace: {}", printable(path.native()), results.error()));
-    for (TraceSeries& series : results->series)
-        std::ranges::sort(series.values);
-    return *std::move(results);
+    std::vector<std::string> sentences;
+    const auto add = [&](double count, fmt::format_string<double&> sentence) {
+        if (count != 0)
+            sentences.push_back("INCOMPLETE: " + fmt::format(sentence, count));
+    };
+    if (!results.problem.empty())
+        sentences.push_back("INCOMPLETE: " + printable(results.problem));
+    add(results.lostEvents,
+        "up to {} events were lost: intervals may be missing, and others span the loss, longer than any that happened");
+    add(results.lostIntervals,
+        "{} points of the parameters file were not measured: there were too many events or values");
+    add(results.lostPoints, "{} traces and points of the parameters file were not read: it has too many");
+    add(results.lostValues, "{} values are missing: the file would have been too large");
+    return sentences;
 }
 
 // --- numbers
@@ -80,6 +86,8 @@ void printHead(const TraceResultsFile& results)
                values == 1 ? "" : "s");
     if (results.withoutValue != 0)
         fmt::print("{} left out: without a value\n", results.withoutValue);
+    for (const std::string& sentence : whatIsMissing(results))
+        fmt::print("{}\n", sentence);
 }
 
 void printTable(const TraceResultsFile& results, std::size_t width)
@@ -180,11 +188,27 @@ void printJson(const TraceSeries& series)
 
 } // namespace
 
-void showTraceResults(const std::filesystem::path& path, bool isJson)
+TraceResultsFile traceResultsOf(std::string_view text, const std::filesystem::path& path)
 {
-    const TraceResultsFile results = read(path);
-    if (!isJson)
-        return printForPeople(results);
-    for (const TraceSeries& series : results.series)
-        printJson(series);
+    auto results = parseTraceResults(text);
+    if (!results)
+        throw std::runtime_error(
+            fmt::format("{} is no results file of a trace: {}", printable(path.native()), results.error()));
+    for (TraceSeries& series : results->series)
+        std::ranges::sort(series.values);
+    return *std::move(results);
+}
+
+int showTraceResults(const TraceResultsFile& results, bool isJson)
+{
+    const std::vector<std::string> missing = whatIsMissing(results);
+    if (isJson) {
+        for (const TraceSeries& series : results.series)
+            printJson(series);
+        for (const std::string& sentence : missing)
+            fmt::print(stderr, "kesto: {}\n", sentence);
+    } else {
+        printForPeople(results);
+    }
+    return missing.empty() ? exitOk : exitIncomplete;
 }

@@ -111,6 +111,35 @@ TEST_F(TraceCommand, PrintsAnObjectANameForPrograms)
         "\n");
 }
 
+TEST_F(TraceCommand, SaysWhatIsMissingBesideTheTableAndEndsWithAStatusOfItsOwn)
+{
+    const auto withMark = [&](const std::string& mark) {
+        return write(R"({"project":"KestoReporting","version":4,"records":[)" + record("one", 42) + "]," + mark + "}");
+    };
+    EXPECT_THAT(tool.print({"trace", withMark(R"("lostEvents":0,"lostIntervals":0,"lostPoints":0,"lostValues":0)")}),
+                StartsWith("KestoReporting, version 4: 1 value\n\n"));
+    for (const auto& [mark, sentence] :
+         {std::pair(
+              R"("lostEvents":1840)",
+              "up to 1840 events were lost: intervals may be missing, and others span the loss, longer than any that "
+              "happened"),
+          std::pair(R"("lostIntervals":2)",
+                    "2 points of the parameters file were not measured: there were too many events or values"),
+          std::pair(R"("lostPoints":7)", "7 traces and points of the parameters file were not read: it has too many"),
+          std::pair(R"("lostValues":9)", "9 values are missing: the file would have been too large"),
+          std::pair(R"("problem":"no\u001btrace")", "no?trace")}) {
+        const Finished shown = tool.run({"trace", withMark(mark)});
+        EXPECT_EQ(shown.status, 3);
+        EXPECT_EQ(shown.errors, "");
+        EXPECT_THAT(shown.output,
+                    StartsWith(std::string("KestoReporting, version 4: 1 value\nINCOMPLETE: ") + sentence + "\n\n"));
+        const Finished json = tool.run({"trace", "--json", path});
+        EXPECT_EQ(json.status, 3);
+        EXPECT_EQ(json.errors, std::string("kesto: INCOMPLETE: ") + sentence + "\n");
+        EXPECT_THAT(json.output, StartsWith(R"({"name":"one",)"));
+    }
+}
+
 TEST_F(TraceCommand, FailsOnWhatIsNoResultsFile)
 {
     const auto expectFailure = [this](const std::string& file, const std::string& reason) {
@@ -132,6 +161,8 @@ TEST_F(TraceCommand, FailsOnWhatIsNoResultsFile)
     };
     expectNoResults(write("[]"), "it is not an object");
     expectNoResults(writeRecords("1"), "its record 1 is not a name, a value and a unit");
+    expectNoResults(write(R"({"project":"P","version":4,"records":[],"lostEvents":"many"})"),
+                    "its \"lostEvents\" is of another kind");
     expectNoResults(write(R"({"records":[)"), "not JSON: Invalid value. (at byte 13)");
 }
 

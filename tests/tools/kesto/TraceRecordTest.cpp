@@ -11,20 +11,34 @@ namespace kesto_tool {
 namespace {
 
 using testing::AllOf;
+using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::StartsWith;
 
-constexpr std::string_view parameters = R"(<plist version="1.0"><dict><key>Children</key><array><dict>
-    <key>Name</key><string>emitter</string><key>Children</key><array><dict>
-    <key>Name</key><string>step</string><key>Type</key><string>Interval</string>
-    <key>KTraceCodeBegin</key><string>21040010</string><key>KTraceCodeEnd</key><string>21040014</string>
-    </dict></array></dict></array></dict></plist>)";
+std::string point(const std::string& name, const std::string& type, const std::string& begin, const std::string& end)
+{
+    return "<dict><key>Name</key><string>" + name + "</string><key>Type</key><string>" + type
+        + "</string><key>KTraceCodeBegin</key><string>" + begin + "</string><key>KTraceCodeEnd</key><string>" + end
+        + "</string></dict>";
+}
+
+std::string parametersWith(const std::string& points)
+{
+    return "<plist version=\"1.0\"><dict><key>Children</key><array><dict><key>Name</key><string>emitter</string>"
+           "<key>Children</key><array>"
+        + points + "</array></dict></array></dict></plist>";
+}
+
+const std::string step = point("step", "Interval", "21040010", "21040014");
 
 class TraceRecord : public testing::Test {
 protected:
+    static constexpr std::string_view noTrace = "this machine lets nobody trace";
+
     void SetUp() override
     {
-        support::writeFile(path("steps.plist"), parameters);
+        std::filesystem::create_directory(path("home"));
+        support::writeFile(path("home/steps.plist"), parametersWith(step));
         tool.setVariable("LOGS_DIRECTORY=" + path("logs"));
     }
     [[nodiscard]] std::string path(const char* name) const { return kestod.directory() / name; }
@@ -35,7 +49,7 @@ protected:
     [[nodiscard]] Finished record(Tool::Arguments further, const Tool::Arguments& command) const
     {
         further.insert(further.begin(),
-                       {"trace", "record", "--socket", kestod.socketPath(), "--params", path("steps.plist")});
+                       {"trace", "record", "--socket", kestod.socketPath(), "--params", path("home/steps.plist")});
         further.emplace_back("--");
         further.insert(further.end(), command.begin(), command.end());
         return tool.run(further);
@@ -54,6 +68,24 @@ protected:
         EXPECT_FALSE(std::filesystem::exists(path("touched")));
     }
 
+    // A service that traces; false where there is none to be had.
+    [[nodiscard]] bool startTracingService()
+    {
+        if (tracefs.problem())
+            return false;
+        enable();
+        kestod.startAndAwait();
+        static_cast<void>(record({}, {"true"}));
+        return !kestod.log().contains("there is no kernel trace: ");
+    }
+    [[nodiscard]] std::vector<std::string> namesInTraces() const
+    {
+        std::vector<std::string> names;
+        for (const auto& entry : std::filesystem::directory_iterator(path("logs/Audio/Traces")))
+            names.push_back(entry.path().filename());
+        return names;
+    }
+
     const support::RealTracefs tracefs; // before the service, which is to see it
     end_to_end::Kestod kestod;
     Tool tool{kestod.directory()};
@@ -61,16 +93,12 @@ protected:
 
 TEST_F(TraceRecord, ShowsWhatAProgramEmitsAndPassesItsStatusOn)
 {
-    if (tracefs.problem())
-        GTEST_SKIP() << *tracefs.problem();
-    enable();
-    kestod.startAndAwait();
+    if (!startTracingService())
+        GTEST_SKIP() << noTrace;
     const std::string copy = path("copy.qdj");
     // Words as they are, whatever they look like to the tool.
     const Finished finished =
         recordEmitter({"--output", copy}, {"7", "5", "[a,b]", "", "--", "--params", "record", "trace", "{}"});
-    if (finished.status == 1 && kestod.log().contains("there is no kernel trace: "))
-        GTEST_SKIP() << "this machine lets nobody trace";
     EXPECT_EQ(finished.status, 5) << finished.errors;
     EXPECT_EQ(finished.errors, "");
     EXPECT_THAT(finished.output,
@@ -88,10 +116,115 @@ TEST_F(TraceRecord, ShowsWhatAProgramEmitsAndPassesItsStatusOn)
     EXPECT_EQ(unknown.errors, "kesto: /nonexistent/program cannot be run: No such file or directory\n");
     EXPECT_EQ(unknown.output, "");
 
-    const Finished elsewhere = record({"--results", path("elsewhere.qdj")}, {"true"});
-    EXPECT_EQ(elsewhere.status, 1);
-    EXPECT_THAT(elsewhere.errors, HasSubstr("the service has written no results to " + path("elsewhere.qdj")));
+    expectNothingIsRun(record({"--results", path("elsewhere.qdj")}, {"touch", path("touched")}),
+                       "the service has written no results to " + path("elsewhere.qdj"));
 }
+
+// --- parameters
+
+TEST_F(TraceRecord, MeasuresByAFileThatTheServiceCannotRead)
+{
+    kestod.hide(path("home"));
+    if (!startTracingService())
+        GTEST_SKIP() << noTrace;
+    const Finished finished = recordEmitter({}, {"7", "0"});
+    EXPECT_EQ(finished.status, 0) << finished.errors;
+    EXPECT_EQ(finished.errors, "");
+    EXPECT_THAT(finished.output, HasSubstr("version 4: 7 values\n"));
+    EXPECT_THAT(namesInTraces(), ElementsAre("tracing_results.qdj")) << "the copy is gone";
+}
+
+TEST_F(TraceRecord, DoesNotRunTheProgramWhenTheServiceCannotBeGivenItsParameters)
+{
+    kestod.hide(path("home"));
+    if (!startTracingService())
+        GTEST_SKIP() << noTrace;
+    std::filesystem::permissions(path("logs/Audio/Traces"), std::filesystem::perms(0755));
+    tool.giveUpRights();
+    const Finished finished = record({}, {"touch", path("touched")});
+    expectNothingIsRun(finished, "Reading from plist file failed with error: No such file or directory");
+    EXPECT_THAT(finished.errors,
+                AllOf(HasSubstr(path("home/steps.plist")), HasSubstr("cannot write " + path("logs/Audio/Traces/")),
+                      HasSubstr("Permission denied")));
+}
+
+TEST_F(TraceRecord, DoesNotRunTheProgramForATraceThatIsNotOfTheKernel)
+{
+    support::writeFile(path("home/steps.plist"),
+                       "<plist><dict><key>Children</key><array><dict><key>TraceType</key><string>OSSignpost</string>"
+                       "<key>Children</key><array>"
+                           + step + "</array></dict></array></dict></plist>");
+    expectNothingIsRun(record({}, {"touch", path("touched")}), "home/steps.plist asks for a trace of signposts");
+}
+
+TEST_F(TraceRecord, SaysBeforeTheProgramRunsWhatWillNotBeMeasured)
+{
+    if (!startTracingService())
+        GTEST_SKIP() << noTrace;
+    support::writeFile(path("home/steps.plist"),
+                       parametersWith(step + point("again", "Intervall", "1", "2")
+                                      + point("far", "Interval", "0x21050000", "21040014")
+                                      + point("beat", "Impulse", "21040010", "")));
+    const std::string warning = "kesto: warning: " + path("home/steps.plist") + ": ";
+    const Finished finished = record({}, {"sh", "-c", "echo running >&2"});
+    EXPECT_EQ(finished.status, 0);
+    EXPECT_EQ(finished.errors,
+              warning
+                  + "point 2, \"again\": its type is none of Interval, Impulse and Level, so it is taken for one like "
+                    "the point before it\n"
+                  + warning
+                  + "point 3, \"far\": measures nothing, for the code 0x21050000 is not from 0x21040000 to "
+                    "0x2104408a\n"
+                  + warning + "point 4, \"beat\": measures nothing, for it begins and ends with one code\nrunning\n");
+
+    support::writeFile(path("home/steps.plist"), parametersWith(""));
+    const Finished without = record({}, {"true"});
+    EXPECT_EQ(without.status, 0);
+    EXPECT_EQ(without.errors, warning + "it has no points, so nothing will be measured\n");
+}
+
+// --- results
+
+TEST_F(TraceRecord, SaysThatResultsAreIncompleteAndEndsWithAStatusOfItsOwn)
+{
+    if (!startTracingService())
+        GTEST_SKIP() << noTrace;
+    std::string points;
+    for (int number = 0; number < 1030; ++number)
+        points += step;
+    support::writeFile(path("home/steps.plist"), parametersWith(points));
+    const std::string missing = "7 traces and points of the parameters file";
+    const Finished finished = recordEmitter({}, {"2", "0"});
+    EXPECT_EQ(finished.status, 3);
+    EXPECT_THAT(finished.errors, HasSubstr(missing));
+    EXPECT_THAT(finished.output, AllOf(HasSubstr("version 4: 2046 values\nINCOMPLETE: "), HasSubstr(missing)));
+    EXPECT_EQ(recordEmitter({}, {"2", "5"}).status, 5) << "that of the program comes first";
+}
+
+TEST_F(TraceRecord, DoesNotRunTheProgramWhenItCouldNotReadTheResults)
+{
+    if (!startTracingService())
+        GTEST_SKIP() << noTrace;
+    std::filesystem::permissions(path("logs"), std::filesystem::perms(0750));
+    tool.giveUpRights();
+    expectNothingIsRun(record({}, {"touch", path("touched")}),
+                       "cannot read " + path("logs/Audio/Traces/tracing_results.qdj") + ": Permission denied");
+}
+
+TEST_F(TraceRecord, ShowsTheResultsAlsoWhenNoCopyCanBeKept)
+{
+    if (!startTracingService())
+        GTEST_SKIP() << noTrace;
+    const Finished finished = recordEmitter({"--output", path("missing/copy.qdj")}, {"7", "0"});
+    EXPECT_EQ(finished.status, 1);
+    EXPECT_EQ(finished.errors, "kesto: cannot write " + path("missing/copy.qdj") + ": No such file or directory\n");
+    EXPECT_THAT(finished.output, AllOf(HasSubstr("version 4: 7 values\n"), HasSubstr("  step\n")));
+    const Finished device = recordEmitter({"--output", "/dev/stderr"}, {"1", "0"});
+    EXPECT_EQ(device.status, 0);
+    EXPECT_THAT(device.errors, StartsWith("{\"project\":\"KestoReporting\""));
+}
+
+// --- what there is to be had
 
 TEST_F(TraceRecord, DoesNotRunTheProgramWhenTheServiceDoesNotTrace)
 {
@@ -106,9 +239,9 @@ TEST_F(TraceRecord, DoesNotRunTheProgramWithoutAService)
 
 TEST_F(TraceRecord, DoesNotRunTheProgramWithoutParameters)
 {
-    support::writeFile(path("steps.plist"), "<plist><dict>\n<key>");
+    support::writeFile(path("home/steps.plist"), "<plist><dict>\n<key>");
     expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist is no parameters file: line 2");
-    std::filesystem::remove(path("steps.plist"));
+    std::filesystem::remove(path("home/steps.plist"));
     expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist: No such file or directory");
 }
 

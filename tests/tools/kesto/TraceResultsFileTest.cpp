@@ -61,6 +61,30 @@ TEST_F(WrittenTraceResults, MayBeNone)
     EXPECT_THAT(read().series, IsEmpty());
 }
 
+TEST_F(WrittenTraceResults, TellWhatIsMissingInThem)
+{
+    write({{"mix", 1}});
+    const TraceResultsFile complete = read();
+    EXPECT_EQ(complete.lostEvents, 0);
+    EXPECT_EQ(complete.lostValues, 0);
+    EXPECT_EQ(complete.problem, "");
+
+    platform::LinuxPerformanceWriter small(files, platform::ProviderLog(log), 1);
+    auto file = small.open(path, "KestoReporting", 4);
+    file->remark("lostEvents", 1840);
+    file->remark("lostIntervals", 2);
+    file->remark("lostPoints", 3);
+    file->remark("problem", "none");
+    file->write("mix", 1, PerformanceUnit::Nanoseconds);
+    file.reset();
+    const TraceResultsFile results = read();
+    EXPECT_EQ(results.lostEvents, 1840);
+    EXPECT_EQ(results.lostIntervals, 2);
+    EXPECT_EQ(results.lostPoints, 3);
+    EXPECT_EQ(results.lostValues, 1);
+    EXPECT_EQ(results.problem, "none");
+}
+
 TEST_F(WrittenTraceResults, MayHaveAnyName)
 {
     write({{"", 1}, {"\x1B[2J\n\"ä\"", 2}, {std::string("a\0b", 3), 3}});

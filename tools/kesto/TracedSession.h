@@ -1,0 +1,43 @@
+// A session of the service that traces from `start` to `stop`, as often as one likes; it ends with its connection at
+// the latest.
+//
+// That the service traces shows twice: a start is answered at once, and a client that asked for it may emit events.
+// Whoever is refused on the way is told where to look.
+#pragma once
+
+#include <condition_variable>
+#include <filesystem>
+#include <functional>
+#include <kesto/kesto.hpp>
+#include <mutex>
+#include <string>
+
+// One thread. Everything throws std::runtime_error, with a line for a person, when it cannot be done.
+class TracedSession {
+public:
+    // An empty socket stands for the service's usual place.
+    explicit TracedSession(const std::string& socket);
+
+    // When it returns, the service has read the parameters and traces, as far as can be seen here.
+    void start(const std::filesystem::path& parameters);
+    // When it returns, the service has written the results, if it could.
+    void stop();
+
+private:
+    using Call = std::function<kesto::Status(const kesto::AnswerCallback& answered)>;
+
+    void ask(const Call& call);
+    void waitForTrace();
+    // On the library's thread.
+    void take(const kesto::Answer& answer);
+    void takeStart(const kesto::Answer& answer);
+    void stateChanged(const kesto::StateChange& change);
+
+    const kesto::ReporterID reporter_;
+    std::mutex lock_;
+    std::condition_variable changed_;
+    bool isAnswered_ = false; // the last call
+    bool mayBeTraced_ = false; // the start was answered at once
+    std::string problem_;
+    kesto::Client client_; // ends first: its thread calls what is above
+};
