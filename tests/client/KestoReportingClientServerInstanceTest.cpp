@@ -4,6 +4,7 @@
 #include "platform/linux/FrameReader.h"
 #include "support/ServiceHarness.h"
 
+#include <cstdlib>
 #include <gmock/gmock.h>
 #include <iostream>
 
@@ -514,6 +515,30 @@ TEST_F(TracedStartTest, IsAnsweredAtOnceAndAgainAtTheStop)
     EXPECT_EQ(player.answersTo(started), (Answers{succeeded, succeeded}));
 }
 
+TEST_F(TracedStartTest, IsAnsweredAtOnceBetweenTheFeatureMessageAndTheActiveSessions)
+{
+    platform.featureFlags.enable("Sonalis", "Tracing");
+    platform.preferences.set("com.quarn.kesto", "device_name", "Speaker");
+    makeTestSession(11);
+    const auto started = player.submit(StartReportingSessionForID, {42});
+    std::vector<std::string> steps;
+    const auto note = [&](const std::string& step) {
+        steps.push_back(step + ", answers: " + std::to_string(player.answersTo(started).size()));
+    };
+    platform.traceMarkers.setObserver([&](std::uint32_t code) {
+        if (code == sessionMessageAccepted)
+            note("features told");
+    });
+    platform.log.setObserver([&](const LogLine& line) {
+        if (line.message.starts_with("0 active reporting session(s)"))
+            note("active sessions said");
+    });
+    platform.workQueues.runAll();
+    platform.traceMarkers.setObserver(nullptr);
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(steps, ElementsAre("features told, answers: 0", "active sessions said, answers: 1"));
+}
+
 TEST_F(TracedStartTest, IsHeldForAnotherServiceType)
 {
     platform.featureFlags.enable("Sonalis", "Tracing");
@@ -742,6 +767,15 @@ TEST_F(ClientDeathTest, EndsTheProcessOnTheCallersThreadWithStatusTwo)
     EXPECT_EXIT(killAloud(), testing::ExitedWithCode(2), "^default kerc DESTROYING SERVICE$");
 }
 
+TEST_F(ClientDeathTest, EndsTheProcessAtOnceWithoutWhatIsLeftForItsExit)
+{
+    const auto killWithAnExitHandler = [this] {
+        std::atexit([] { std::_Exit(7); });
+        player.submit(KillService, {});
+    };
+    EXPECT_EXIT(killWithAnExitHandler(), testing::ExitedWithCode(2), "") << "other threads are at work then";
+}
+
 // --- connection loss
 
 TEST_F(ClientTest, StopsItsStartedSessionsInOrderAndLeavesWhenTheConnectionIsLost)
@@ -807,23 +841,104 @@ TEST_F(ClientTest, CarriesOutTheCallsThatCameBeforeItsEnd)
     EXPECT_EQ(player.object(), nullptr);
 }
 
-TEST_F(ClientTest, DoesNothingFurtherOnceTheServiceIsGone)
+// --- without the service
+
+// The service object is gone. One client has the session 41, which is created, and 42, which is started; another client
+// has 43. Every operation is answered, and does what it can do without the service object.
+class OrphanTest : public ClientTest {
+protected:
+    OrphanTest()
+    {
+        create(41);
+        create(42);
+        start(42);
+        recorder.call(CreateReportingSession, 43);
+        harness.service.reset();
+        platform.analytics.use("*");
+        harness.forget();
+    }
+    void TearDown() override
+    {
+        EXPECT_THAT(platform.log.lines("kers"), IsEmpty());
+        EXPECT_THAT(platform.analytics.asked(), IsEmpty());
+    }
+};
+
+TEST_F(OrphanTest, CreatesSessions)
 {
-    const auto orphan = std::make_shared<KestoReportingClientServerInstance>(
-        17, std::weak_ptr<KestoReportingServiceDelegateProtocol>());
-    harness.forget();
-    orphan->createReportingSession(42, [](const auto&, bool) { });
-    orphan->startReportingSessionForID(42, [](const auto&, bool) { });
-    std::vector<std::optional<KestoReportingError>> answers;
-    const auto note = [&](const auto& error) { answers.push_back(error); };
-    orphan->sendMessage({{"a", 1}}, 4, 1, std::vector<std::int64_t>{42}, note);
-    orphan->sendMessage({{"a", 1}}, 4, 1, std::nullopt, note);
-    orphan->handleConnectionError();
+    EXPECT_EQ(create(44), answeredOnce(succeeded));
+    EXPECT_NE(player.session(44), nullptr);
+}
+
+TEST_F(OrphanTest, SetsTheServiceTypeAndTheConfigurationOfItsSessions)
+{
+    EXPECT_EQ(player.call(SetServiceType, 3, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.call(SetConfiguration, Dictionary{{"a", 1}}, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(42)->serviceType(), 3);
+    EXPECT_EQ(player.session(42)->configuration(), (Dictionary{{"a", 1}}));
+}
+
+TEST_F(OrphanTest, TellsTheServiceTypeOfItsOwnSessionsOnly)
+{
+    player.session(42)->setServiceType(3);
+    EXPECT_EQ(player.call(GetServiceNameForReporterID, 42), answeredOnce({null, 3}));
+    EXPECT_EQ(player.call(GetServiceNameForReporterID, 43), answeredOnce({null, 65535}));
+}
+
+TEST_F(OrphanTest, ValidatesItsOwnSessionsOnly)
+{
+    EXPECT_EQ(player.call(ValidReporterID, 42),
+              answeredOnce({null, Dictionary{{"reporterID", 42}, {"serviceType", 0}}}));
+    EXPECT_EQ(player.call(ValidReporterID, 43),
+              answeredOnce({null, Dictionary{{"reporterID", 0}, {"serviceType", 65535}}}));
+}
+
+TEST_F(OrphanTest, StartsNoSession)
+{
+    EXPECT_EQ(start(41), answeredOnce(succeeded));
+    EXPECT_FALSE(player.session(41)->started());
+}
+
+TEST_F(OrphanTest, DeliversNoMessage)
+{
+    EXPECT_EQ(player.call(SendMessage, Dictionary{{"a", 1}}, 4, 1, Array{42}), answeredOnce(delivered))
+        << "reporting is not disabled";
+    EXPECT_EQ(player.call(SendMessage, Dictionary{{"a", 1}}, 4, 1, null), answeredOnce(delivered));
+    EXPECT_THAT(*player.session(42)->nestedAggregatedPayloadData(), IsEmpty());
+    EXPECT_THAT(platform.log.lines("kerr"), IsEmpty()) << "there is no stand-alone session either";
+}
+
+TEST_F(OrphanTest, StopsNoSession)
+{
+    EXPECT_EQ(stop(42), answeredOnce(succeeded));
+    EXPECT_TRUE(player.session(42)->started());
+}
+
+TEST_F(OrphanTest, DestroysSessions)
+{
+    EXPECT_EQ(player.call(DestroyReportingSession, 42), answeredOnce(succeeded));
+    EXPECT_EQ(player.session(42), nullptr);
+    EXPECT_THAT(platform.log.lines("kerr"), testing::Contains(IsLine(Debug, "kerr", "ending session 42")));
+}
+
+TEST_F(OrphanTest, ListsNoReporters)
+{
+    EXPECT_EQ(player.call(GetAllReporters), answeredOnce({null, Array{}}));
+}
+
+TEST_F(OrphanTest, DoesNothingWhenItsConnectionIsLost)
+{
+    player.object()->handleConnectionError();
     platform.workQueues.runAll();
-    EXPECT_THAT(answers, ElementsAre(std::nullopt, std::nullopt)) << "reporting is not disabled";
-    EXPECT_THAT(platform.analytics.asked(), IsEmpty());
-    EXPECT_FALSE(orphan->clientReportingSessionMap().find(42)->started());
-    EXPECT_THAT(platform.log.lines("kers"), IsEmpty());
+    EXPECT_TRUE(player.session(42)->started());
+    EXPECT_THAT(lines(), IsEmpty());
+}
+
+using OrphanDeathTest = OrphanTest;
+
+TEST_F(OrphanDeathTest, EndsTheProcessWithStatusTwo)
+{
+    EXPECT_EXIT(player.submit(KillService, {}), testing::ExitedWithCode(2), "");
 }
 
 } // namespace

@@ -307,6 +307,23 @@ TEST_F(DriverLogs, TellTheSessionAndTheAnalyticsBridgeByKindOfChannel)
               Value(5));
 }
 
+TEST_F(DriverLogs, TellTheSessionFirstAndThenTheAnalyticsBridge)
+{
+    publish(simple(10));
+    publish(states({{.name = "On", .transitions = 1, .residency = 100}}));
+    begin();
+    publish(simple(15));
+    std::vector<std::string> steps;
+    platform.traceMarkers.setObserver([&](std::uint32_t) { steps.emplace_back("session"); });
+    platform.analytics.setObserver([&](const std::string& name) { steps.push_back(name); });
+    end();
+    platform.traceMarkers.setObserver(nullptr);
+    platform.analytics.setObserver(nullptr);
+    EXPECT_THAT(steps,
+                ElementsAre("session", "com.quarn.kesto.Cavlet.Simple", "com.quarn.longformaudio.Cavlet.Simple",
+                            "session", "com.quarn.kesto.Cavlet.State", "com.quarn.longformaudio.Cavlet.State"));
+}
+
 TEST_F(DriverLogs, AreNoneWhenNothingChanged)
 {
     publish(simple(10));
@@ -375,7 +392,12 @@ TEST_F(DriverLogs, LeaveOutADriverThatCannotBeSampled)
     publish(other);
     platform.reportingChannels.failures("Speaker", std::nullopt).sample = 11;
     EXPECT_THAT(end(), ElementsAre("Cavlet_Simple_1: 4"));
-    EXPECT_THAT(errors(), ElementsAre("creating samples of driver Speaker-(null): error 11"));
+    EXPECT_THAT(platform.log.lines("kerd"),
+                ElementsAre(IsLine(Info, "kerd", "getting latest samples"),
+                            IsLine(Info, "kerd", "done getting latest samples"),
+                            IsLine(Error, "kerd", "creating samples of driver Speaker-(null): error 11"),
+                            IsLine(Info, "kerd", "getting latest samples"),
+                            IsLine(Info, "kerd", "done getting latest samples")));
 }
 
 TEST_F(DriverLogs, SurviveADifferenceThatFails)

@@ -152,6 +152,25 @@ TEST_F(DriverUtility, LeavesOutADriverThatCannotBeSubscribedTo)
     EXPECT_THAT(utility.getSnapShot(), SizeIs(7));
 }
 
+TEST_F(DriverUtility, SaysNothingOfADriverForWhichNeitherChannelsNorAnErrorComeBack)
+{
+    publishAll();
+    channels.failures("Rx", std::nullopt).copiesNothing = true;
+    channels.failures("Tx", std::nullopt).subscribesToNothing = true;
+    const KestoReportingDriverUtility utility;
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Info, "kerd", "creating cavlet driver utility"),
+                            IsLine(Info, "kerd", "subscribed to group group QuarnZT4-(null)"),
+                            IsLine(Info, "kerd", "subscribed to group group Speaker-(null)"),
+                            IsLine(Info, "kerd", "subscribed to group group (null)-MCA"),
+                            IsLine(Info, "kerd", "subscribed to group group Haptics-Stats"),
+                            IsLine(Info, "kerd", "subscribed to group group StateTransitionTimes_ms-(null)"),
+                            IsLine(Info, "kerd", "subscribed to group group (null)-HwAudio2")));
+    EXPECT_THAT(descriptions(utility),
+                ElementsAre("QuarnZT4-(null)", "Speaker-(null)", "(null)-MCA", "Haptics-Stats",
+                            "StateTransitionTimes_ms-(null)", "(null)-HwAudio2"));
+}
+
 // --- snapshots
 
 TEST_F(DriverUtility, TakesASnapshotOfEveryDriverUnderItsDescription)

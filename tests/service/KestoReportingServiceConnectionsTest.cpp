@@ -1,5 +1,6 @@
 // A connection's beginning and end as the service sees them, and the event that tells how long it lasted.
 #include "support/ServiceHarness.h"
+#include "support/WatchedThread.h"
 
 #include <gmock/gmock.h>
 
@@ -93,6 +94,25 @@ TEST_F(ConnectionTest, HasAClientOfItsOwn)
     EXPECT_EQ(clients()[1]->clientReportingSessionMap().find(42), nullptr);
 }
 
+TEST_F(ConnectionTest, GetsItsClientWhileNoSessionIsLookedUp)
+{
+    std::optional<WatchedThread> looker;
+    bool waits = false;
+    platform.log.setObserver([&](const LogLine& line) {
+        if (line.message != "new client with pid 17")
+            return;
+        looker.emplace([&] { EXPECT_EQ(harness.service->findReportingSessionForID(42), nullptr); });
+        waits = looker->fallsAsleep();
+    });
+    onServerQueue(platform.workQueues, [&] {
+        const auto connection = accept();
+        looker.reset();
+    });
+    platform.log.setObserver(nullptr);
+    EXPECT_TRUE(waits) << "both hold the service object's lock";
+    EXPECT_THAT(platform.log.lines("kers"), Contains(IsLine(Error, "kers", "failed to find reporting session 42")));
+}
+
 TEST_F(ConnectionTest, EndsWhenACallBreaksTheProtocolAndNoOtherDoes)
 {
     const auto hostile = connect();
@@ -124,6 +144,17 @@ TEST_F(ConnectionTest, ThatIsClosedLeavesTheRegistryAndTellsItsTime)
     EXPECT_THAT(platform.analytics.events(),
                 ElementsAre(AnalyticsEvent{std::string(uptimeEvent), {{"processName", "player"}, {"seconds", 12.5}}}));
     EXPECT_EQ(uptimes()[0].kind(), Number::Kind::Float64);
+}
+
+TEST_F(ConnectionTest, ThatIsClosedHasItsClientLeaveBeforeAnythingElseIsDone)
+{
+    const auto connection = connect();
+    clients()[0]->setClientStartDate(std::nullopt);
+    std::vector<std::size_t> submitted;
+    platform.log.setObserver([&](const LogLine&) { submitted.push_back(platform.workQueues.pending()); });
+    connection->close();
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(submitted, ElementsAre(1, 1)) << "before each of the two lines";
 }
 
 TEST_F(ConnectionTest, OfNoTimeIsStillADouble)

@@ -361,6 +361,18 @@ TEST_F(InternalServiceTest, HandsMessagesToTheBugCaptureManagerAsTheyAre)
     EXPECT_EQ(*signature.find("detectedProcess"), Value("player"));
 }
 
+TEST_F(InternalServiceTest, HandsMessagesToTheBugCaptureManagerUnderTheirOwnType)
+{
+    auto player = harness.connect();
+    player.call(CreateReportingSession, 42);
+    harness.forget();
+    for (const int type : {7, 9})
+        for (const int seconds : {1, 2})
+            player.call(SendMessage, Dictionary{{"Haptic_Active_Hardware_Time_Seconds", seconds}}, 4, type, Array{42});
+    EXPECT_THAT(platform.log.lines("kerb"), IsEmpty());
+    EXPECT_EQ(platform.bugCapture.reportersMade(), 0) << "only messages of type 8 count";
+}
+
 TEST_F(InternalServiceTest, TellsBugCapturesOfItsClientsAndTheirSessions)
 {
     const auto describeState = [this] {

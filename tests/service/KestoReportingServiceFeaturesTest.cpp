@@ -56,7 +56,7 @@ TEST_F(FeaturesTest, AreHandledOnTheServerQueue)
     EXPECT_THAT(platform.log.lines(), SizeIs(3));
 }
 
-TEST(FeatureRegistration, ThatFailsIsOnlySaid)
+TEST(FeatureRegistration, ThatFailsIsOnlySaidAndItsTokenIsKept)
 {
     TestPlatform platform;
     platform.notifications.failRegistration(ringerNotification, 9);
@@ -66,6 +66,7 @@ TEST(FeatureRegistration, ThatFailsIsOnlySaid)
     EXPECT_THAT(platform.log.lines(), testing::Contains(IsLine(Default, "kers", "notify setup result 9 token 0")));
     const auto state = onServerQueue(platform.workQueues, [&] { return service->getFeaturesState(); });
     EXPECT_EQ(state, std::nullopt) << "the state of token 0 cannot be read";
+    EXPECT_THAT(platform.notifications.asked(), ElementsAre(0)) << "although it is asked for";
 }
 
 // --- state

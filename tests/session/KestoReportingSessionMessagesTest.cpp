@@ -74,6 +74,16 @@ TEST_F(SessionMessagesTest, AreRecordedUnderAnIdentifierWithTheirTag)
     EXPECT_EQ(session->messageIdentifierCounts(), (Dictionary{{"Playback_Start", 1}}));
 }
 
+TEST_F(SessionMessagesTest, AreTaggedWithTheirOwnTypeAfterOthersOfTheirCategory)
+{
+    for (const AudioEventType type : {1, 2, 3, 1})
+        send(Dictionary{{"type", type}}, playback, type);
+    EXPECT_THAT(recorded(),
+                ElementsAre(record("Playback_Start_1", {{"type", 1}, {"audiotag", "PlaybackStart"}}),
+                            record("Playback_Stop_1", {{"type", 2}, {"audiotag", "PlaybackStop"}}),
+                            record("Playback_Activate_1", {{"type", 3}, {"audiotag", "PlaybackActivate"}})));
+}
+
 TEST_F(SessionMessagesTest, AreNamedByGroupAndUnknownNumbersToo)
 {
     send(Dictionary{}, 0x10000004, start);
@@ -379,16 +389,16 @@ TEST_F(SingleMessageTest, DrawsTheDelayOfAnAlarmFromAMinute)
     }
 }
 
-TEST_F(SingleMessageTest, DoesNothingASecondLater)
+TEST_F(SingleMessageTest, DoesNothingASecondLaterOnTheBackgroundQueue)
 {
     platform.analytics.use("*");
     send(4);
-    EXPECT_EQ(platform.workQueues.delayed(), 1U);
+    EXPECT_THAT(platform.workQueues.delayed(), ElementsAre(&platform.workQueues.backgroundQueue()));
     platform.log.clear();
     platform.workQueues.advance(999'999'999ns);
-    EXPECT_EQ(platform.workQueues.delayed(), 1U);
+    EXPECT_THAT(platform.workQueues.delayed(), SizeIs(1));
     platform.workQueues.advance(1ns);
-    EXPECT_EQ(platform.workQueues.delayed(), 0U);
+    EXPECT_THAT(platform.workQueues.delayed(), IsEmpty());
     EXPECT_THAT(platform.log.lines(), IsEmpty());
     EXPECT_THAT(platform.analytics.asked(), IsEmpty());
     EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());

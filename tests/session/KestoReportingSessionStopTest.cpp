@@ -192,6 +192,18 @@ TEST_F(SessionStop, RecordsNoVolumeEventThatRepeatsTheOneBeforeButHandsItToTheBr
     EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Volume.Summary"), SizeIs(2));
 }
 
+TEST_F(SessionStop, SendsVolumeEventsOnlyOfMoreThanHalfASecond)
+{
+    for (const auto& [from, to] : {std::pair(10.0, 10.5), std::pair(20.0, 20.625)}) {
+        send(from, {{"session_output_running", true}, {"PomoSessionVolume", 0.5}});
+        send(to, {{"session_output_running", false}});
+    }
+    session->stop();
+    const auto events = platform.analytics.payloads("com.quarn.kesto.Volume.Summary");
+    ASSERT_THAT(events, SizeIs(1));
+    EXPECT_EQ(events[0].find("play_seconds")->text(), "0.625");
+}
+
 TEST_F(SessionStop, SendsNoVolumeEventWithoutAnApplication)
 {
     session->setConfiguration(Dictionary{{"HostApplicationDisplayID", Value()}});

@@ -252,6 +252,20 @@ TEST_F(SessionTest, LetsNoConfigurationOutgrowItsLimit)
     EXPECT_EQ(session->configuration(), (Dictionary{{"a", 1}}));
 }
 
+TEST_F(SessionTest, TakesAConfigurationThatIsExactlyAsLargeAsItsLimitAndNoneThatIsAByteLarger)
+{
+    const std::string text(1'048'565, 'x'); // 1,048,573 bytes with its key and the heads
+    session->setConfiguration(Dictionary{{"a", text}});
+    forget();
+    session->setConfiguration(Dictionary{{"b", 24}});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", text}})) << "24 takes two bytes";
+    EXPECT_THAT(platform.log.lines(), SizeIs(1));
+    forget();
+    session->setConfiguration(Dictionary{{"b", 23}});
+    EXPECT_EQ(session->configuration(), (Dictionary{{"a", text}, {"b", 23}})) << "23 takes one";
+    EXPECT_THAT(platform.log.lines(), IsEmpty());
+}
+
 TEST_F(SessionTest, PaysForItsConfiguration)
 {
     const Dictionary configuration{{"a", std::string(1000, 'x')}};

@@ -109,6 +109,17 @@ TEST_F(SessionTracing, IsNotSetUpWithoutAFileWhichIsSaid)
     EXPECT_THAT(lines(), ElementsAre(IsLine(Error, "kerr", "TracefileName empty. Failed to setup tracing")));
 }
 
+TEST_F(SessionTracing, ThatIsSetUpInThePlaceOfARunningOneIsNotStarted)
+{
+    session->start();
+    EXPECT_TRUE(session->startedTracing());
+    session->setupTracing(std::string(file));
+    EXPECT_FALSE(session->startedTracing());
+    EXPECT_EQ(tracesStarted(), 1U);
+    session->stop();
+    EXPECT_EQ(filesWritten(), 0U) << "there is nothing to stop";
+}
+
 // --- starting
 
 TEST_F(SessionTracing, StartsWithTheSessionWhenAllConditionsHold)

@@ -109,6 +109,18 @@ TEST_F(SummaryFile, IsNoneWhileNotStarted)
     EXPECT_THAT(platform.fileSystem.files, IsEmpty());
 }
 
+TEST_F(SummaryFile, IsNoneOfASessionThatWasNeverStarted)
+{
+    session = std::make_shared<KestoReportingSession>(43, std::vector<std::int32_t>{7});
+    record({{"a", 1}});
+    platform.log.clear();
+    session->stop();
+    session->writeSummaryJson();
+    EXPECT_THAT(platform.fileSystem.files, IsEmpty());
+    EXPECT_THAT(platform.fileSystem.directories, IsEmpty());
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "ending session 43")));
+}
+
 TEST(SummaryFileOnCustomerBuilds, IsNone)
 {
     support::TestPlatform platform;
@@ -383,6 +395,18 @@ TEST_F(SummaryFile, IsWrittenAlthoughItsDirectoryCouldNotBeMadeAndThatIsSaidTwic
     EXPECT_THAT(write().second, StartsWith("["));
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Error, "kerr",
+                                   "can't create logging directory at /diagnostics/Audio/Reporting: Permission denied"),
+                            IsLine(Error, "kerr", "jsonOutput writeToURL: Permission denied")));
+}
+
+TEST_F(SummaryFile, SaysWhatJsonCannotBeforeItSaysThatItsDirectoryCouldNotBeMade)
+{
+    platform.fileSystem.directoryError = std::make_error_code(std::errc::permission_denied);
+    record({{"a", std::numeric_limits<double>::quiet_NaN()}});
+    EXPECT_EQ(write().second, "");
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Error, "kerr", "dataWithJSONObject: a number is not finite"),
+                            IsLine(Error, "kerr",
                                    "can't create logging directory at /diagnostics/Audio/Reporting: Permission denied"),
                             IsLine(Error, "kerr", "jsonOutput writeToURL: Permission denied")));
 }

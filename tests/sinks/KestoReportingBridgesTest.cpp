@@ -96,6 +96,26 @@ TEST_F(FennicBridgeTest, NamesWhatItDoesNotKnow)
                             "com.quarn.kesto.Undefined.Generic", "com.quarn.telephony.Undefined.Generic"));
 }
 
+// Names are remembered at places that their numbers give: 65 lies at the place of 1, 64 at that of 0, 68 at that of 4.
+TEST_F(FennicBridgeTest, NamesEventsByTheirOwnNumbersAfterOthers)
+{
+    platform.analytics.use("*");
+    session->type = 0;
+    send({}, 4, 1);
+    send({}, 4, 65);
+    session->type = 64;
+    send({}, 4, 65);
+    send({}, 68, 65);
+    session->type = 0;
+    send({}, 4, 1);
+    EXPECT_THAT(platform.analytics.sent(),
+                ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.generic.Playback.Start",
+                            "com.quarn.kesto.Playback.Generic", "com.quarn.generic.Playback.Generic",
+                            "com.quarn.kesto.Playback.Generic", "com.quarn.telephony.Playback.Generic",
+                            "com.quarn.kesto.Undefined.Generic", "com.quarn.telephony.Undefined.Generic",
+                            "com.quarn.kesto.Playback.Start", "com.quarn.generic.Playback.Start"));
+}
+
 TEST_F(FennicBridgeTest, SendsEachNameOnlyWhenItIsWanted)
 {
     platform.analytics.use("com.quarn.kesto.*");

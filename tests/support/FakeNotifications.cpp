@@ -30,6 +30,7 @@ FakeNotifications::registerNotification(std::string_view name, std::shared_ptr<p
 
 std::expected<std::uint64_t, platform::NotificationStatus> FakeNotifications::state(std::int32_t token) const
 {
+    asked_.push_back(token);
     const auto place = static_cast<std::size_t>(token) - 1;
     if (place >= registered_.size())
         return std::unexpected(unreadable);

@@ -27,6 +27,8 @@ public:
 
     // The names that were registered; a registration's token is its place here, from 1.
     [[nodiscard]] std::vector<std::string> registered() const;
+    // The tokens whose state was asked for, in order.
+    [[nodiscard]] const std::vector<std::int32_t>& asked() const { return asked_; }
 
     Registration registerNotification(std::string_view name, std::shared_ptr<platform::WorkQueue> queue,
                                       Handler handler) override;
@@ -39,6 +41,7 @@ private:
         Handler handler;
     };
     std::vector<Registered> registered_;
+    mutable std::vector<std::int32_t> asked_;
     std::map<std::string, std::uint64_t, std::less<>> states_;
     std::map<std::string, platform::NotificationStatus, std::less<>> failures_;
 };

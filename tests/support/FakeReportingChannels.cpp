@@ -72,7 +72,7 @@ FakeReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group
     const auto selection = std::make_shared<Selection>(Name(group), Name(subgroup));
     const Failures& failing = failures(selection->group, selection->subgroup);
     asked_.emplace_back(selection->group, selection->subgroup);
-    if (failing.copy && !failing.copiesAnyway)
+    if (failing.copiesNothing || (failing.copy && !failing.copiesAnyway))
         return {.channels = nullptr, .error = failing.copy};
     return {.channels = selection, .error = failing.copy};
 }
@@ -86,8 +86,9 @@ platform::ReportingChannels::Subscribed FakeReportingChannels::createSubscriptio
 {
     const auto& selection = dynamic_cast<const Selection&>(channels);
     auto subscription = std::make_shared<Subscription>();
-    if (const auto error = failures(selection.group, selection.subgroup).subscription)
-        return {.subscription = std::move(subscription), .channels = nullptr, .error = error};
+    const Failures& failing = failures(selection.group, selection.subgroup);
+    if (failing.subscribesToNothing || failing.subscription)
+        return {.subscription = std::move(subscription), .channels = nullptr, .error = failing.subscription};
     return {.subscription = std::move(subscription), .channels = std::make_shared<Selection>(selection), .error = {}};
 }
 

@@ -21,7 +21,9 @@ public:
     struct Failures {
         std::optional<Error> copy;
         bool copiesAnyway = false; // channels come back beside the error
+        bool copiesNothing = false; // neither channels nor an error come back
         std::optional<Error> subscription;
+        bool subscribesToNothing = false; // likewise
         std::optional<Error> sample;
     };
 

@@ -100,6 +100,14 @@ void FakeWorkQueues::discardAll()
         items_.pop_front(); // one by one: letting go of an item may submit another
 }
 
+std::vector<const platform::WorkQueue*> FakeWorkQueues::delayed() const
+{
+    std::vector<const platform::WorkQueue*> queues;
+    for (const DelayedItem& item : delayed_)
+        queues.push_back(item.queue);
+    return queues;
+}
+
 std::shared_ptr<platform::WorkQueue> FakeWorkQueues::makeSerialQueue(std::string_view name,
                                                                      platform::QualityOfService quality)
 {

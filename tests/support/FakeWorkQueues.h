@@ -41,9 +41,10 @@ public:
     // Drops what has not run.
     void discardAll();
 
-    // Items that wait to be run, and items that wait for their time.
+    // How many items wait to be run.
     [[nodiscard]] std::size_t pending() const { return items_.size(); }
-    [[nodiscard]] std::size_t delayed() const { return delayed_.size(); }
+    // The queues of the items that wait for their time, in the order of time.
+    [[nodiscard]] std::vector<const platform::WorkQueue*> delayed() const;
     // The serial queues that were made, in order.
     [[nodiscard]] const std::vector<MadeQueue>& made() const { return made_; }
 

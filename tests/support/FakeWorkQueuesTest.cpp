@@ -60,6 +60,7 @@ TEST_F(FakeWorkQueuesTest, DelayedItemsRunAtTheirTimeInTheOrderOfTime)
     queues.submitAfter(3s, *serial, [&] { EXPECT_DOUBLE_EQ(clock.secondsSince1970(), start + 3); });
     queues.submitAfter(3s, *serial, noting("late"));
     queues.submitAfter(1s, queues.backgroundQueue(), noting("soon"));
+    EXPECT_THAT(queues.delayed(), ElementsAre(&queues.backgroundQueue(), serial.get(), serial.get()));
     queues.advance(999ms);
     EXPECT_THAT(noted, ElementsAre());
     queues.advance(4s);

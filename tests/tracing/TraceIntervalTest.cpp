@@ -241,6 +241,14 @@ TEST_F(AnyThreadInterval, HasAnAverageInThePrecisionOfAFloat)
     EXPECT_EQ(interval.getAverageResult(), (16'777'216.0F + 8.0F) / 4);
 }
 
+TEST_F(AnyThreadInterval, HasAnAverageWhoseSumIsAFloatAtEveryStep)
+{
+    EXPECT_THAT(
+        process({begin(1), end(16'777'217), begin(20'000'000), end(20'000'001), begin(20'000'002), end(20'000'003)}),
+        ElementsAre(16'777'216, 1, 1));
+    EXPECT_EQ(interval.getAverageResult(), 5'592'405.5F) << "neither of the ones changes a sum of 2^24";
+}
+
 TEST_F(AnyThreadInterval, HasNoNumberForItsAverageWithoutResults)
 {
     EXPECT_TRUE(std::isnan(interval.getAverageResult()));

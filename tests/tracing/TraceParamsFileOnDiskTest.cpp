@@ -20,6 +20,22 @@ using testing::Contains;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
+// The process's current directory, a new one, until it is gone.
+class CurrentDirectory {
+public:
+    explicit CurrentDirectory(const fs::path& path)
+    {
+        fs::create_directory(path);
+        fs::current_path(path);
+    }
+    ~CurrentDirectory() { fs::current_path(before_); }
+    CurrentDirectory(const CurrentDirectory&) = delete;
+    CurrentDirectory& operator=(const CurrentDirectory&) = delete;
+
+private:
+    const fs::path before_ = fs::current_path();
+};
+
 class TraceParamsFileOnDisk : public testing::Test {
 protected:
     TraceParamsFileOnDisk() { platform.fileSystem.disk = &disk; }
@@ -97,6 +113,13 @@ TEST_F(TraceParamsFileOnDisk, ThatIsMissingOrLeadsNowhereIsNotRead)
     expectRefused(root / "circle", std::errc::too_many_symbolic_link_levels);
     expectRefused(root / std::string(300, 'x'), std::errc::filename_too_long);
     expectRefused("/" + std::string(100'000, 'x'), std::errc::filename_too_long);
+}
+
+TEST_F(TraceParamsFileOnDisk, WithARelativePathIsNotReadWhenTheCurrentDirectoryIsGone)
+{
+    const CurrentDirectory gone(root / "gone");
+    fs::remove(root / "gone");
+    expectRefused("traces.plist", std::errc::no_such_file_or_directory);
 }
 
 TEST_F(TraceParamsFileOnDisk, WhosePathHasANulIsNotTheFileBeforeIt)

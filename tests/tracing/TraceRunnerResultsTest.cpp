@@ -2,6 +2,7 @@
 #include "tracing/RunnerFixture.h"
 
 #include <algorithm>
+#include <cstdlib>
 #include <iostream>
 
 namespace {
@@ -207,6 +208,16 @@ TEST_F(RunnerResultsDeathTest, EndTheProcessWithStatusOneWhenTheFileCannotBeOpen
     platform.performanceWriter.canOpen = false;
     EXPECT_EXIT(traceAloud(), testing::ExitedWithCode(1),
                 "info kert Completed trace....In write perf data.... 1\ninfo kert Failed to open quilldat writer\n$");
+}
+
+TEST_F(RunnerResultsDeathTest, EndTheProcessAtOnceWithoutWhatIsLeftForItsExit)
+{
+    platform.performanceWriter.canOpen = false;
+    const auto traceWithAnExitHandler = [this] {
+        std::atexit([] { std::_Exit(7); });
+        trace({5});
+    };
+    EXPECT_EXIT(traceWithAnExitHandler(), testing::ExitedWithCode(1), "") << "other threads are at work then";
 }
 
 TEST_F(RunnerResultsDeathTest, EndTheProcessWithStatusOneAfterSayingThatTheDirectoryCannotBeMade)

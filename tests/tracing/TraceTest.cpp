@@ -7,6 +7,7 @@
 #include "tracing/TracePoint.h"
 
 #include <cmath>
+#include <cstddef>
 #include <gmock/gmock.h>
 
 namespace {
@@ -170,6 +171,37 @@ TEST(TraceEventsTest, AreKeptInOrder)
     for (std::size_t number = 0; number < count; ++number)
         ASSERT_EQ(events.all()[number].timestamp, number);
     EXPECT_EQ(events.lost(), 0U);
+}
+
+TEST(TraceEventsTest, HaveRoomForTenThousandFromTheBeginning)
+{
+    TraceEvents events;
+    fill(events, 1);
+    const trace_point* const first = &events.all().front();
+    fill(events, 9'999);
+    ASSERT_THAT(events.all(), SizeIs(10'000));
+    EXPECT_EQ(&events.all().front(), first) << "nothing had to be moved";
+}
+
+// Providers and readers agree on it byte by byte.
+TEST(TraceEvent, IsARecordOf96BytesWithEachFieldInItsPlace)
+{
+    EXPECT_EQ(sizeof(trace_point), 96U);
+    EXPECT_EQ(offsetof(trace_point, timestamp), 0U);
+    EXPECT_EQ(offsetof(trace_point, arguments), 8U);
+    EXPECT_EQ(sizeof(trace_point::arguments), 32U);
+    EXPECT_EQ(offsetof(trace_point, threadID), 40U);
+    EXPECT_EQ(offsetof(trace_point, eventCode), 48U);
+    EXPECT_EQ(sizeof(trace_point::eventCode), 4U);
+    EXPECT_EQ(offsetof(trace_point, cpu), 52U);
+    EXPECT_EQ(sizeof(trace_point::cpu), 4U);
+    EXPECT_EQ(offsetof(trace_point, wallTime.seconds), 56U);
+    EXPECT_EQ(offsetof(trace_point, wallTime.microseconds), 64U);
+    EXPECT_EQ(sizeof(trace_point::wallTime), 16U);
+    EXPECT_EQ(offsetof(trace_point, texts), 72U);
+    EXPECT_EQ(sizeof(trace_point::texts), 16U);
+    EXPECT_EQ(offsetof(trace_point, value), 88U);
+    EXPECT_EQ(sizeof(trace_point::value), 4U);
 }
 
 TEST(TraceEventsTest, AreLostAndCountedWhenTheMemoryOfAllTracesIsUsedUp)

@@ -128,6 +128,15 @@ TEST(AudioMessageTag, JoinsTheNamesOfCategoryAndType)
               (Dictionary{{"audiotag", "UndefinedUnknown"}}));
 }
 
+TEST(AudioMessageTag, IsThatOfItsOwnMessageAfterOthers)
+{
+    EXPECT_EQ(KestoReportingUtilityAddAudioMessageTag({}, 4, 1), (Dictionary{{"audiotag", "PlaybackStart"}}));
+    EXPECT_EQ(KestoReportingUtilityAddAudioMessageTag({}, 4, 2), (Dictionary{{"audiotag", "PlaybackStop"}}));
+    EXPECT_EQ(KestoReportingUtilityAddAudioMessageTag({}, 2, 2), (Dictionary{{"audiotag", "RecordStop"}}));
+    EXPECT_EQ(KestoReportingUtilityAddAudioMessageTag({}, 2, 2), (Dictionary{{"audiotag", "RecordStop"}}));
+    EXPECT_EQ(KestoReportingUtilityAddAudioMessageTag({}, 4, 1), (Dictionary{{"audiotag", "PlaybackStart"}}));
+}
+
 TEST(AudioMessageTag, ReplacesAnotherTagAndLeavesTheArgumentAlone)
 {
     const Dictionary message{{"audiotag", "mine"}, {"a", 1}};
@@ -226,6 +235,15 @@ RC_GTEST_PROP(NormalisedMessage, IsWhatTheThreeStepsMakeOfIt, (bool isInternalBu
     RC_ASSERT(isRight(later, 2)); // of a shape that is known now
     platform.deviceProperties.setInternalBuild(!isInternalBuild);
     RC_ASSERT(isRight(later, 2));
+}
+
+TEST(NormaliseMessage, GetsTheTagOfItsOwnTypeBehindAMessageOfTheSameCategory)
+{
+    const support::TestPlatform platform;
+    EXPECT_EQ(KestoReportingUtilityNormaliseMessage({{"a", 1}}, 4, 1),
+              (Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}}));
+    EXPECT_EQ(KestoReportingUtilityNormaliseMessage({{"a", 1}}, 4, 2),
+              (Dictionary{{"a", 1}, {"audiotag", "PlaybackStop"}}));
 }
 
 TEST(NormaliseMessage, MessagesOfOneShapeGetOneShape)

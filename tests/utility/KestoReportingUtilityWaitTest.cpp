@@ -1,6 +1,7 @@
 // Waiting for a flag that another thread sets. The only tests of this folder that take real time, and as little
 // of it as they can: they wait for threads, never for a while.
 #include "support/TestPlatform.h"
+#include "support/WatchedThread.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <chrono>
@@ -27,13 +28,14 @@ protected:
                                          KestoReportingTraceCategory());
     }
 
-    // Returns once the other thread says that it waits, and holds the lock no more: it sleeps then.
-    void letItFallAsleep()
+    // Returns once so many other threads say that they wait, and hold the lock no more: they sleep then.
+    void letThemFallAsleep(std::size_t threads)
     {
-        while (platform.log.lines().empty())
+        while (platform.log.lines().size() < threads)
             std::this_thread::yield();
         const foundation::Lock lock(condition.lock);
     }
+    void letItFallAsleep() { letThemFallAsleep(1); }
 
     support::TestPlatform platform;
     KestoReportingCondition condition;
@@ -72,6 +74,19 @@ TEST_F(WaitTest, GoesOnWhenItIsSignalled)
     EXPECT_TRUE(flag);
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Info, "kert", "waiting for it"), IsLine(Info, "kert", "continuing")));
+}
+
+TEST_F(WaitTest, GoesOnAloneWhenTwoWaitForOneSignal)
+{
+    const auto waitLong = [this] { EXPECT_TRUE(wait(aMinute)); };
+    const support::WatchedThread first(waitLong);
+    const support::WatchedThread second(waitLong);
+    letThemFallAsleep(2);
+    KestoReportingUtilitySignal(condition, flag);
+    while (!first.isDone() && !second.isDone())
+        std::this_thread::yield();
+    EXPECT_NE(first.fallsAsleep(), second.fallsAsleep()) << "the other is not woken, although the flag is set";
+    KestoReportingUtilitySignal(condition, flag);
 }
 
 TEST_F(WaitTest, BeginsAnewAfterAWakeUpWithoutTheFlag)

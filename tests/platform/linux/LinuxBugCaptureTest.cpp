@@ -228,6 +228,21 @@ TEST_F(LinuxBugCaptureTest, RefusesSnapshotsThatComeTooThick)
     EXPECT_EQ(*support::parseJson(third)->dictionary()->find("refusedBefore"), Value(4)) << "it is not forgotten";
 }
 
+TEST_F(LinuxBugCaptureTest, RefusesSnapshotsWhileAsManyWaitForTheDiskHoweverLongThatTakes)
+{
+    LinuxBugCapture capture(state, sources(), ProviderLog(log), {.mostAtOnce = 2, .seconds = 60});
+    request(capture);
+    request(capture);
+    clock.advance(1000);
+    request(capture);
+    queues.runAll();
+    EXPECT_EQ(std::ranges::count_if(responses, succeeded), 2);
+    EXPECT_EQ(capture.refusedSnapshots(), 1U);
+    request(capture);
+    queues.runAll();
+    EXPECT_EQ(std::ranges::count_if(responses, succeeded), 3) << "none waits any more";
+}
+
 TEST_F(LinuxBugCaptureTest, AClockThatIsSetBackDoesNotMakeItRefuseForEver)
 {
     LinuxBugCapture capture(state, sources(), ProviderLog(log), {.mostAtOnce = 1, .seconds = 60});

@@ -4,11 +4,11 @@
 #include "platform/linux/SerialQueue.h"
 #include "platform/linux/Thread.h"
 #include "support/Threads.h"
+#include "support/WatchedThread.h"
 
 #include <algorithm>
 #include <array>
 #include <atomic>
-#include <fstream>
 #include <gtest/gtest.h>
 #include <latch>
 #include <pthread.h>
@@ -128,23 +128,13 @@ protected:
     {
         queue->submit([&] { queueThread = gettid(); });
         drain(*queue);
-        while (stateOf(queueThread) != 'S')
+        while (!support::isAsleep(queueThread))
             std::this_thread::yield();
         SerialQueue::Helper helper;
         queue->submit([] { });
         helper.help(); // after which this thread has seen what that one did
         history.clear();
         threads.clear();
-    }
-
-    // As the kernel tells: "1234 (name) S ...".
-    static char stateOf(pid_t thread)
-    {
-        std::ifstream file("/proc/self/task/" + std::to_string(thread) + "/stat");
-        std::string text;
-        std::getline(file, text, ')');
-        file >> text;
-        return text.empty() ? '?' : text.front();
     }
 
     void submit(int item)
@@ -292,7 +282,7 @@ TEST_F(TurnsTest, TheQueuesThreadWaitsUntilAHelpedTurnHasEnded)
             otherThread = gettid();
             queue.reset(); // wakes the queue's thread, which finds something to do
         });
-        while (otherThread == 0 || stateOf(otherThread) != 'S' || stateOf(queueThread) != 'S')
+        while (otherThread == 0 || !support::isAsleep(otherThread) || !support::isAsleep(queueThread))
             std::this_thread::yield();
         history.push_back(1);
     });

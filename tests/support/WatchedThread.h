@@ -1,0 +1,55 @@
+// Threads as the kernel sees them, for tests of who waits for whom: such a test goes on when a thread sleeps, not after
+// a while.
+#pragma once
+
+#include <atomic>
+#include <fstream>
+#include <functional>
+#include <string>
+#include <thread>
+#include <unistd.h>
+#include <utility>
+
+namespace support {
+
+// Whether that thread of this process sleeps. The kernel says so: "1234 (name) S ...".
+inline bool isAsleep(pid_t thread)
+{
+    std::ifstream file("/proc/self/task/" + std::to_string(thread) + "/stat");
+    std::string text;
+    std::getline(file, text, ')');
+    file >> text;
+    return text.starts_with('S');
+}
+
+// Does its work on a thread of its own. Its destructor waits until the work is done.
+class WatchedThread {
+public:
+    explicit WatchedThread(std::function<void()> work)
+        : thread_([this, work = std::move(work)] {
+              number_ = ::gettid();
+              work();
+              isDone_ = true;
+          })
+    {
+    }
+
+    [[nodiscard]] bool isDone() const { return isDone_; }
+    // Waits until the thread sleeps or its work is done. True when it sleeps.
+    [[nodiscard]] bool fallsAsleep() const
+    {
+        while (!isDone_) {
+            if (number_ != 0 && isAsleep(number_))
+                return true;
+            std::this_thread::yield();
+        }
+        return false;
+    }
+
+private:
+    std::atomic<pid_t> number_{0};
+    std::atomic<bool> isDone_{false};
+    std::jthread thread_; // goes first: it uses the others
+};
+
+} // namespace support
