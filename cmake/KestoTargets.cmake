@@ -16,6 +16,9 @@ if(KESTO_CCACHE)
   set(CMAKE_C_COMPILER_LAUNCHER ${CMAKE_CXX_COMPILER_LAUNCHER})
 endif()
 
+# In debug builds the standard library asserts, too, what it expects of its callers: an index within bounds, for one.
+add_compile_definitions($<$<CONFIG:Debug>:_GLIBCXX_ASSERTIONS>)
+
 # Locks are annotated; clang proves that what they guard is only touched while they are held.
 add_compile_options(-Wall -Wextra -Wpedantic -Werror -Wshadow -Wimplicit-fallthrough
                     $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
