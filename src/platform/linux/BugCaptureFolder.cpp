@@ -23,6 +23,7 @@ namespace platform {
 namespace {
 
 constexpr const char* folderName = "bug-captures";
+constexpr const char* lastNumberName = "bug-captures.last"; // beside the folder, which people may remove
 constexpr const char* stateName = "state";
 constexpr mode_t permissions = 0750; // of folders: what a capture holds is for the service's group
 
@@ -37,12 +38,19 @@ std::error_code lastError()
 constexpr std::string_view coming = ".new";
 constexpr std::string_view going = ".old";
 
-// The number that a capture's name begins with; 0 for names of other things.
-std::uint64_t numberOf(std::string_view name)
+// The number that the text begins with, if that character follows it; else 0. There is a number after each.
+std::uint64_t numberBefore(char end, std::string_view text)
 {
     std::uint64_t number = 0;
-    const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), number);
-    return error == std::errc() && end != name.data() + name.size() && *end == '-' ? number : 0;
+    const auto [read, error] = std::from_chars(text.data(), text.data() + text.size(), number);
+    const bool isNumber = error == std::errc() && read != text.data() + text.size() && *read == end;
+    return isNumber && number < std::numeric_limits<std::uint64_t>::max() ? number : 0;
+}
+
+// Of a capture; 0 for names of other things.
+std::uint64_t numberOf(std::string_view name)
+{
+    return numberBefore('-', name);
 }
 
 std::string utcText(double time)
@@ -103,13 +111,19 @@ BugCaptureFolder::BugCaptureFolder(std::filesystem::path stateDirectory, Limits 
         removeLeftovers(folder->get());
 }
 
+// The state directory may be a link: it is the administrator's. What is in it is the service's own.
+std::expected<FileDescriptor, std::error_code> BugCaptureFolder::openStateDirectory() const
+{
+    FileDescriptor opened(::open(stateDirectory_.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+    if (!opened)
+        return std::unexpected(lastError());
+    return opened;
+}
+
 std::expected<FileDescriptor, std::error_code> BugCaptureFolder::open() const
 {
-    // The state directory may be a link: it is the administrator's. The folder is the service's own.
-    const FileDescriptor parent(::open(stateDirectory_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
-    if (!parent)
-        return std::unexpected(lastError());
-    return openDirectoryAt(parent.get(), folderName);
+    const auto parent = openStateDirectory();
+    return parent ? openDirectoryAt(parent->get(), folderName) : std::unexpected(parent.error());
 }
 
 std::expected<FileDescriptor, std::error_code> BugCaptureFolder::openOrMake() const
@@ -156,6 +170,31 @@ std::vector<BugCaptureFolder::Capture> BugCaptureFolder::capturesIn(int folder)
     return captures;
 }
 
+// 0 when none was kept.
+std::uint64_t BugCaptureFolder::lastNumber() const
+{
+    constexpr std::size_t longest = 32;
+    const auto parent = openStateDirectory();
+    const auto text = parent ? readFileAt(parent->get(), lastNumberName, longest) : std::unexpected(parent.error());
+    return text ? numberBefore('\n', *text) : 0;
+}
+
+std::error_code BugCaptureFolder::keepLastNumber(std::uint64_t number) const
+{
+    const auto parent = openStateDirectory();
+    if (!parent)
+        return parent.error();
+    const std::string unfinished = std::string(lastNumberName) + ".new";
+    removeTreeAt(parent->get(), unfinished); // of a service that was killed
+    if (const auto error = writeFileAt(parent->get(), unfinished, fmt::format("{}\n", number)))
+        return error;
+    if (::renameat(parent->get(), unfinished.c_str(), parent->get(), lastNumberName) == 0)
+        return syncDirectory(parent->get());
+    const auto error = lastError();
+    removeTreeAt(parent->get(), unfinished);
+    return error;
+}
+
 std::expected<std::string, std::error_code> BugCaptureFolder::nextName(double time) const
 {
     const auto folder = openOrMake();
@@ -164,7 +203,7 @@ std::expected<std::string, std::error_code> BugCaptureFolder::nextName(double ti
     const auto names = namesIn(folder->get(), everything);
     if (!names)
         return std::unexpected(names.error());
-    std::uint64_t highest = 0;
+    std::uint64_t highest = lastNumber();
     for (const std::string& name : *names)
         highest = std::max(highest, numberOf(name));
     return fmt::format("{:08}-{}", highest + 1, utcText(time));
@@ -223,6 +262,8 @@ std::error_code BugCaptureFolder::add(const std::string& name, const std::vector
     const std::string hidden(coming);
     removeTreeAt(folder->get(), hidden); // of an attempt that failed
     auto error = write(folder->get(), hidden, files, isTooMuch ? std::vector<File>() : state);
+    if (!error)
+        error = keepLastNumber(std::max(numberOf(name), lastNumber()));
     if (!error && ::renameat(folder->get(), hidden.c_str(), folder->get(), name.c_str()) != 0)
         error = lastError();
     if (error)

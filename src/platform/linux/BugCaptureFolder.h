@@ -5,6 +5,7 @@
 //             signature.json      what was seen, and where
 //             response.json       what whoever asked was told
 //             state/              how the device was: the bulk
+//     bug-captures.last           the last number that was used, whatever has been removed since
 //
 // A capture appears as a whole, by one rename of a hidden folder, and so does its bulk go when room is needed, the
 // oldest first. What stays is its tombstone: that this was seen, when, and how often. What hidden folders are left by a
@@ -62,10 +63,13 @@ public:
 
 private:
     struct Capture;
+    [[nodiscard]] std::expected<FileDescriptor, std::error_code> openStateDirectory() const;
     [[nodiscard]] std::expected<FileDescriptor, std::error_code> open() const;
     [[nodiscard]] std::expected<FileDescriptor, std::error_code> openOrMake() const;
     static void removeLeftovers(int folder);
     [[nodiscard]] static std::vector<Capture> capturesIn(int folder);
+    [[nodiscard]] std::uint64_t lastNumber() const;
+    [[nodiscard]] std::error_code keepLastNumber(std::uint64_t number) const;
     void makeRoom(int folder, std::uint64_t bytes) const;
     [[nodiscard]] std::error_code write(int folder, const std::string& hidden, const std::vector<File>& files,
                                         const std::vector<File>& state) const;

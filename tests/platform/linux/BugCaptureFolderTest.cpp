@@ -53,6 +53,7 @@ protected:
     const support::TemporaryDirectory directory;
     const fs::path state = directory.path();
     const fs::path captures = state / "bug-captures";
+    const fs::path lastNumber = state / "bug-captures.last";
 };
 
 TEST_F(BugCaptureFolderTest, MakesNothingBeforeThereIsACapture)
@@ -92,6 +93,48 @@ TEST_F(BugCaptureFolderTest, NumbersGoOnWhateverTheClockSaysAndAfterARestart)
     EXPECT_EQ(folder.nextName(0), "00000003-19700101T000000Z");
     fs::remove_all(capture(1)); // by a person
     EXPECT_EQ(folder.nextName(noon), "00000003-20270115T080000Z");
+}
+
+TEST_F(BugCaptureFolderTest, ANumberIsNeverUsedAgainWhateverIsRemoved)
+{
+    {
+        BugCaptureFolder folder(state);
+        ASSERT_FALSE(addTo(folder));
+        ASSERT_FALSE(addTo(folder));
+        fs::remove_all(capture(2)); // the newest, by a person
+        EXPECT_EQ(folder.nextName(noon), "00000003-20270115T080000Z");
+        ASSERT_FALSE(addTo(folder));
+        fs::remove_all(captures);
+        EXPECT_EQ(folder.nextName(noon), "00000004-20270115T080000Z");
+        fs::remove_all(captures);
+    }
+    BugCaptureFolder folder(state);
+    ASSERT_FALSE(addTo(folder));
+    EXPECT_THAT(namesIn(captures), ElementsAre(capture(4).filename())) << "after a restart, too";
+}
+
+TEST_F(BugCaptureFolderTest, TheCapturesThemselvesCountWhereTheLastNumberIsLostOrBroken)
+{
+    BugCaptureFolder folder(state);
+    for (int each = 0; each < 3; ++each)
+        ASSERT_FALSE(addTo(folder));
+    for (const char* broken : {"", "x\n", "2", "2\n", "-1\n", "99999999999999999999\n", "18446744073709551615\n"}) {
+        support::writeFile(lastNumber, broken);
+        EXPECT_EQ(folder.nextName(noon), "00000004-20270115T080000Z") << broken;
+    }
+    fs::remove(lastNumber);
+    EXPECT_EQ(folder.nextName(noon), "00000004-20270115T080000Z");
+    ASSERT_FALSE(addTo(folder));
+    EXPECT_EQ(support::readFile(lastNumber), "4\n");
+}
+
+TEST_F(BugCaptureFolderTest, CapturesNothingWhoseNumberItCannotKeep)
+{
+    fs::create_directories(lastNumber / "in its place");
+    BugCaptureFolder folder(state);
+    EXPECT_TRUE(addTo(folder));
+    EXPECT_THAT(namesIn(captures), IsEmpty());
+    EXPECT_THAT(namesIn(state), ElementsAre("bug-captures", "bug-captures.last")) << "nor is anything left";
 }
 
 TEST_F(BugCaptureFolderTest, OldestBulkGoesFirstAndItsSignatureStays)
@@ -251,7 +294,7 @@ TEST_F(BugCaptureFolderTest, FollowsALinkToTheStateDirectoryWhichIsTheAdministra
     fs::create_directory_symlink("real", state / "link");
     BugCaptureFolder folder(state / "link");
     EXPECT_FALSE(addTo(folder));
-    EXPECT_THAT(namesIn(state / "real"), ElementsAre("bug-captures"));
+    EXPECT_THAT(namesIn(state / "real"), ElementsAre("bug-captures", "bug-captures.last"));
 }
 
 TEST_F(BugCaptureFolderTest, RemovingBulkRemovesNothingThatLinksLeadTo)
