@@ -71,11 +71,12 @@ public:
     void handleConnectionError();
 
 private:
-    // What is delivered, and the name of the process that sent it.
+    // What is delivered, and the process that sent it.
     struct Message {
         foundation::Dictionary payload;
         AudioEventCategory category;
         std::uint16_t type;
+        std::int32_t sender;
         std::string processName;
     };
     using Session = std::shared_ptr<KestoReportingSession>;

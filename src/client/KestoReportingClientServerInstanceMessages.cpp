@@ -4,6 +4,7 @@
 // Both orders are part of the contract.
 #include "client/KestoReportingClientServerInstance.h"
 #include "foundation/Format.h"
+#include "platform/BugCapture.h"
 #include "platform/Connection.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
@@ -21,9 +22,9 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
 {
     // The sender is whoever makes this call, which need not be the process that this client was made for.
     const platform::Connection* caller = platform::Connection::current();
-    auto processName =
-        KestoReportingUtilityProcessNameForPID(caller != nullptr ? caller->processIdentifier() : processIdentifier_);
-    submit([message = Message{std::move(message), category, type, std::move(processName).value_or("(null)")},
+    const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
+    auto processName = KestoReportingUtilityProcessNameForPID(sender);
+    submit([message = Message{std::move(message), category, type, sender, std::move(processName).value_or("(null)")},
             reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
                   reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
@@ -100,10 +101,11 @@ void KestoReportingClientServerInstance::deliverStandalone(KestoReportingService
 void KestoReportingClientServerInstance::deliverToSinks(KestoReportingServiceDelegateProtocol& delegate,
                                                         const Message& message, const Session& session)
 {
-    const auto& [payload, category, type, processName] = message;
+    const auto& [payload, category, type, sender, processName] = message;
     KestoReportingFennicBridge::handleEvent(payload, category, type, session);
     KestoReportingGimboUtility::handleEvent(payload, category, type, session);
     KestoReportingTrelmBridge::handleEvent(payload, category, type, session);
+    const platform::BugCapture::SenderScope scope(sender);
     delegate.handleEventForVorp(payload, category, type, session, processName);
 }
 

@@ -3,10 +3,12 @@
 
 #include "foundation/Value.h"
 
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <optional>
 #include <string_view>
+#include <utility>
 
 namespace platform {
 
@@ -37,6 +39,25 @@ public:
     // when that is made. To be set before the first; none unless it is.
     using StateDescription = std::function<foundation::Value()>;
     virtual void setStateDescription(const StateDescription& /*describe*/) { }
+
+    // The process whose message the calling thread is handling, or 0. Processes share names: a snapshot that is asked
+    // for meanwhile is of this one.
+    [[nodiscard]] static std::int32_t currentSender() noexcept { return currentSender_; }
+
+    // Makes a process the current sender of this thread while its message is being handled.
+    class SenderScope {
+    public:
+        explicit SenderScope(std::int32_t sender) noexcept : outer_(std::exchange(currentSender_, sender)) { }
+        ~SenderScope() { currentSender_ = outer_; }
+        SenderScope(const SenderScope&) = delete;
+        SenderScope& operator=(const SenderScope&) = delete;
+
+    private:
+        const std::int32_t outer_;
+    };
+
+private:
+    static inline thread_local std::int32_t currentSender_ = 0;
 };
 
 } // namespace platform

@@ -398,6 +398,28 @@ TEST_F(ClientAndServiceTest, HandsTheMessageItsSessionAndTheSendersNameToTheBugC
     send(std::vector<std::int64_t>{42});
 }
 
+TEST_F(ClientAndServiceTest, TellsWhichProcessSentTheMessageWhileTheBugCaptureManagerHasIt)
+{
+    createSession(42);
+    const FakeConnection callers(18);
+    const auto sendFromBoth = [&](const auto& reporterIDs) {
+        {
+            const platform::Connection::CallScope call(callers);
+            send(reporterIDs);
+        }
+        send(reporterIDs);
+    };
+    ON_CALL(*service, getAllActiveReportingSessions).WillByDefault([&] { return std::vector{session(42)}; });
+    std::vector<std::int32_t> senders;
+    ON_CALL(*service, handleEventForVorp).WillByDefault([&](auto&, auto, auto, auto&, auto&) {
+        senders.push_back(platform::BugCapture::currentSender());
+    });
+    sendFromBoth(std::optional(std::vector<std::int64_t>{42}));
+    sendFromBoth(std::optional<std::vector<std::int64_t>>());
+    EXPECT_THAT(senders, ElementsAre(18, 17, 18, 17));
+    EXPECT_EQ(platform::BugCapture::currentSender(), 0);
+}
+
 TEST_F(ClientAndServiceTest, TakesTheSendersNameWhenTheCallIsMade)
 {
     createSession(42);

@@ -373,6 +373,17 @@ TEST_F(InternalServiceTest, HandsMessagesToTheBugCaptureManagerUnderTheirOwnType
     EXPECT_EQ(platform.bugCapture.reportersMade(), 0) << "only messages of type 8 count";
 }
 
+TEST_F(InternalServiceTest, AsksForABugCaptureAsOfTheProcessThatSentTheMessage)
+{
+    harness.connect("player");
+    auto second = harness.connect("player");
+    second.call(CreateReportingSession, 42);
+    for (const int seconds : {1, 2})
+        second.call(SendMessage, Dictionary{{"Haptic_Active_Hardware_Time_Seconds", seconds}}, 4, gimbo, Array{42});
+    ASSERT_THAT(platform.bugCapture.snapshots(), SizeIs(1));
+    EXPECT_EQ(platform.bugCapture.snapshots()[0].sender, ServiceHarness::firstPID + 1);
+}
+
 TEST_F(InternalServiceTest, TellsBugCapturesOfItsClientsAndTheirSessions)
 {
     const auto describeState = [this] {

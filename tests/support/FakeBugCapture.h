@@ -16,6 +16,7 @@ public:
         std::optional<foundation::Value> event;
         std::optional<foundation::Value> payload;
         platform::BugCaptureReporter::Reply reply;
+        std::int32_t sender = 0; // the current one when it was asked for
     };
 
     // The snapshots asked for, in order; `snapshots()[0].reply(...)` answers one.
@@ -51,7 +52,8 @@ private:
                              const std::optional<foundation::Value>& event,
                              const std::optional<foundation::Value>& payload, Reply reply) override
         {
-            snapshots_.push_back({std::move(signature), duration, event, payload, std::move(reply)});
+            snapshots_.push_back(
+                {std::move(signature), duration, event, payload, std::move(reply), platform::BugCapture::currentSender()});
         }
 
     private:

@@ -113,12 +113,14 @@ FileDescriptor openFolder(const std::filesystem::path& path)
 } // namespace
 
 Dictionary processEvidence(const std::filesystem::path& proc, std::string_view processName,
-                           const BugEvidenceLimits& limits)
+                           std::int64_t first, const BugEvidenceLimits& limits)
 {
     std::int64_t found = 0;
     std::vector<Value> processes;
     if (const FileDescriptor folder = openFolder(proc)) {
-        for (const std::int64_t number : processNumbers(folder.get())) {
+        auto numbers = processNumbers(folder.get());
+        std::ranges::stable_partition(numbers, [first](std::int64_t number) { return number == first; });
+        for (const std::int64_t number : numbers) {
             const auto process = openDirectoryAt(folder.get(), std::to_string(number));
             if (!process || nameOf(process->get()) != processName)
                 continue;

@@ -8,6 +8,7 @@
 #include "foundation/Value.h"
 
 #include <cstddef>
+#include <cstdint>
 #include <filesystem>
 #include <string_view>
 
@@ -23,10 +24,10 @@ struct BugEvidenceLimits {
 };
 
 // The processes of that name, as {"name", "found": how many there are, "processes": [{"pid", "status": [line...],
-// "stat", "cmdline", "wchan", "limits"}...]}, the lowest numbers first. `proc` is where the kernel shows processes. Any
-// thread.
+// "stat", "cmdline", "wchan", "limits"}...]}: first the one of that number, if it is given and has the name, then those
+// of the lowest numbers. `proc` is where the kernel shows processes. Any thread.
 [[nodiscard]] foundation::Dictionary processEvidence(const std::filesystem::path& proc, std::string_view processName,
-                                                     const BugEvidenceLimits& limits = {});
+                                                     std::int64_t first = 0, const BugEvidenceLimits& limits = {});
 
 // Every file below asound/ of `proc`, as {"card0/pcm0p/sub0/status": [line...]}; empty where there is no sound. Any
 // thread.

@@ -43,8 +43,8 @@ public:
     void requestSnapshot(Dictionary signature, double duration, const std::optional<Value>& event,
                          const std::optional<Value>& payload, Reply reply) override
     {
-        capture_.submit(
-            {std::move(signature), duration, event.value_or(Value()), payload.value_or(Value()), std::move(reply)});
+        capture_.submit({std::move(signature), duration, event.value_or(Value()), payload.value_or(Value()),
+                         std::move(reply), currentSender()});
     }
 
 private:
@@ -163,11 +163,13 @@ std::vector<BugCaptureFolder::File> LinuxBugCapture::stateAt(double time, const 
                            {"duration", request.duration},
                            {"event", request.event},
                            {"payload", request.payload},
+                           {"sender", request.sender == 0 ? Value() : Value(request.sender)},
                            {"refusedBefore", refusedSnapshots()}};
     return {{"request.json", jsonOf(asked)},
             {"log.txt", sources_.log.text()},
             {"processes.json",
-             jsonOf(processEvidence(sources_.proc, process == nullptr ? std::string_view() : process->stringView()))},
+             jsonOf(processEvidence(sources_.proc, process == nullptr ? std::string_view() : process->stringView(),
+                                    request.sender))},
             {"sound.json", jsonOf(soundEvidence(sources_.proc))},
             {"service.json", jsonOf(request.state)}};
 }

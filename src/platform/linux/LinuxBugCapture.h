@@ -67,6 +67,7 @@ private:
         foundation::Value event;
         foundation::Value payload;
         BugCaptureReporter::Reply reply;
+        std::int32_t sender = 0; // whose message led to it; 0 when that is not known
         foundation::Value state = {}; // of whoever asks
     };
 

@@ -84,6 +84,18 @@ TEST_F(BugEvidenceTest, DescribesOnlySoManyProcessesOfTheSameNameAndCountsAll)
     EXPECT_THAT(pids(evidence), testing::ElementsAre(4, 5, 6, 11)) << "by number, not by text";
 }
 
+TEST_F(BugEvidenceTest, DescribesTheProcessThatIsAskedForFirstHoweverManyShareItsName)
+{
+    for (const int number : {30, 4, 200, 5, 11, 6})
+        addProcess(number, "player");
+    addProcess(201, "other");
+    EXPECT_THAT(pids(processEvidence(proc, "player", 200)), testing::ElementsAre(200, 4, 5, 6));
+    EXPECT_EQ(*processEvidence(proc, "player", 200).find("found"), Value(6)) << "each is counted once";
+    EXPECT_THAT(pids(processEvidence(proc, "player", 5)), testing::ElementsAre(5, 4, 6, 11));
+    EXPECT_THAT(pids(processEvidence(proc, "player", 201)), testing::ElementsAre(4, 5, 6, 11)) << "it is another one";
+    EXPECT_THAT(pids(processEvidence(proc, "player", 999)), testing::ElementsAre(4, 5, 6, 11)) << "it is gone";
+}
+
 TEST_F(BugEvidenceTest, KeepsSoMuchOfAFileAtMost)
 {
     addProcess(7, "player");

@@ -125,6 +125,7 @@ TEST_F(LinuxBugCaptureTest, KeepsWhatWasSeenWhatWasSaidAndHowTheDeviceWas)
                           {"duration", 2.5},
                           {"event", "event"},
                           {"payload", Dictionary{{"a", 1}}},
+                          {"sender", Value()},
                           {"refusedBefore", 0}}));
     EXPECT_THAT(file("state/log.txt"), HasSubstr("something is wrong\n"));
     EXPECT_EQ(*json("state/processes.json").find("found"), Value(1));
@@ -144,6 +145,22 @@ TEST_F(LinuxBugCaptureTest, KeepsHowTheServiceWasWhenItAsked)
     request(capture);
     EXPECT_EQ(timesAsked, 1) << "a refusal needs none";
     queues.runAll();
+}
+
+TEST_F(LinuxBugCaptureTest, KeepsTheProcessWhoseMessageWasHandledBeforeOthersOfItsName)
+{
+    fs::copy(proc / "7", proc / "70");
+    LinuxBugCapture capture(state, sources(), ProviderLog(log));
+    {
+        const BugCapture::SenderScope sender(70);
+        request(capture);
+    }
+    queues.runAll();
+    const Array processes = *json("state/processes.json").find("processes")->array();
+    ASSERT_EQ(processes.size(), 2U);
+    EXPECT_EQ(*processes[0].dictionary()->find("pid"), Value(70)) << "the sender";
+    EXPECT_EQ(*processes[1].dictionary()->find("pid"), Value(7));
+    EXPECT_EQ(*json("state/request.json").find("sender"), Value(70));
 }
 
 TEST_F(LinuxBugCaptureTest, KeepsEvidenceOfADeviceWithoutProcOrSound)
