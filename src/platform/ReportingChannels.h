@@ -45,6 +45,8 @@ struct ReportingChannel {
 
 struct ReportingSample {
     std::vector<ReportingChannel> channels;
+    // Whether all that was asked for could be looked at. Where not, a channel may be missing that is there.
+    bool isWhole = true;
 };
 
 using ReportingChannelError = std::int64_t; // the platform's error code

@@ -16,7 +16,6 @@
 #include <fmt/format.h>
 #include <iterator>
 #include <memory>
-#include <stdexcept>
 #include <thread>
 
 namespace {
@@ -187,10 +186,10 @@ public:
     void list()
     {
         const ReportingSample sample = read();
-        if (sample.channels.empty() && !options_.isJson)
-            fmt::print("No channels are published in {}.\n", options_.root.native());
-        else
+        if (!sample.channels.empty() || options_.isJson)
             print(sample);
+        else if (hasSucceeded())
+            fmt::print("No channels are published in {}.\n", options_.root.native());
     }
 
     // Prints what has changed, look by look.
@@ -211,23 +210,42 @@ public:
         }
     }
 
+    // Whether the tree could be read at the last look.
+    [[nodiscard]] bool hasSucceeded() const { return failure_.empty(); }
+
 private:
+    using Lines = std::vector<std::string>;
+
     // What is wrong is told when it is first met.
     ReportingSample read()
     {
         auto reading = tree_.read(options_.selection);
-        if (!reading)
-            throw std::runtime_error(fmt::format("{}: {}", options_.root.native(), reading.error().message()));
-        std::ranges::sort(reading->problems);
-        for (const auto& problem : reading->problems)
-            if (!std::ranges::binary_search(problems_, problem))
-                fmt::print(stderr, "kesto: channel {} is left out: {}\n", printable(problem.path), problem.reason);
-        problems_ = std::move(reading->problems);
-        if (reading->leftOut > 0)
-            fmt::print(stderr, "kesto: {} files are left out: there are too many\n", reading->leftOut);
-        ReportingSample sample{std::move(reading->channels)};
+        ReportingSample sample{.channels = {}, .isWhole = reading && reading->leftOut.isNothing()};
+        if (reading) {
+            tellProblems(std::move(reading->problems));
+            tellOnce(reading->leftOut.inWords({}), limits_);
+            sample.channels = std::move(reading->channels);
+        }
+        tellOnce(reading ? Lines() : Lines{options_.root.native() + ": " + reading.error().message()}, failure_);
         std::ranges::move(soundCards_.read(options_.selection), std::back_inserter(sample.channels));
         return sample;
+    }
+
+    void tellProblems(std::vector<platform::ChannelProblem> problems)
+    {
+        std::ranges::sort(problems);
+        for (const auto& problem : problems)
+            if (!std::ranges::binary_search(problems_, problem))
+                fmt::print(stderr, "kesto: channel {} is left out: {}\n", printable(problem.path), problem.reason);
+        problems_ = std::move(problems);
+    }
+
+    static void tellOnce(Lines lines, Lines& told)
+    {
+        if (lines != told)
+            for (const std::string& line : lines)
+                fmt::print(stderr, "kesto: {}\n", line);
+        told = std::move(lines);
     }
 
     void print(const ReportingSample& sample) const
@@ -252,7 +270,9 @@ private:
     const platform::ChannelTree tree_;
     const platform::SoundCards soundCards_;
     const Table table_;
-    std::vector<platform::ChannelProblem> problems_;
+    std::vector<platform::ChannelProblem> problems_; // at the last look
+    Lines limits_; // that it met
+    Lines failure_; // why it could not be had
 };
 
 } // namespace
@@ -283,6 +303,6 @@ void addChannelsCommand(CLI::App& application, int& exitStatus)
             run.watch();
         else
             run.list();
-        exitStatus = exitOk;
+        exitStatus = run.hasSucceeded() ? exitOk : exitFailure;
     });
 }

@@ -109,9 +109,13 @@ void shareOut(std::vector<StateResidency>& states)
 ReportingSample channelDifference(const ReportingSample& from, const ReportingSample& to)
 {
     const Index earlier(from.channels);
-    ReportingSample difference = to;
-    for (ReportingChannel& channel : difference.channels) {
-        const ReportingChannel* before = earlier.find(channel);
+    ReportingSample difference{.channels = {}, .isWhole = from.isWhole && to.isWhole};
+    difference.channels.reserve(to.channels.size());
+    for (const ReportingChannel& now : to.channels) {
+        const ReportingChannel* before = earlier.find(now);
+        if (before == nullptr && !from.isWhole)
+            continue;
+        ReportingChannel& channel = difference.channels.emplace_back(now);
         if (before != nullptr && wentOn(*before, channel))
             subtract(*before, channel);
         shareOut(channel.states);

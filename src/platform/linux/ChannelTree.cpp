@@ -2,6 +2,7 @@
 // names.
 #include "platform/linux/ChannelTree.h"
 
+#include "foundation/Format.h"
 #include "foundation/String.h"
 #include "platform/linux/ChannelFile.h"
 #include "platform/linux/FileDescriptor.h"
@@ -81,7 +82,7 @@ private:
         std::vector<Entry> entries;
         while (const dirent* entry = ::readdir(folder)) {
             if (left_.names == 0) {
-                ++reading_.leftOut; // at least
+                ++reading_.leftOut.beyondNames;
                 break;
             }
             --left_.names;
@@ -113,7 +114,7 @@ private:
     void readChannel(int folder, unsigned char type)
     {
         if (left_.channels == 0 || left_.bytes == 0) {
-            ++reading_.leftOut;
+            ++(left_.channels == 0 ? reading_.leftOut.beyondChannels : reading_.leftOut.beyondBytes);
             return;
         }
         if (type != DT_REG && type != DT_UNKNOWN) // to open a device may already do something
@@ -178,6 +179,23 @@ private:
 };
 
 } // namespace
+
+std::vector<std::string> LeftOutChannels::inWords(const ChannelTreeLimits& limits) const
+{
+    std::vector<std::string> lines;
+    if (beyondChannels > 0)
+        lines.push_back(foundation::format("channels left out of a sample: {}, beyond the {} that it takes",
+                                           beyondChannels, limits.channels));
+    if (beyondBytes > 0)
+        lines.push_back(
+            foundation::format("channels left out of a sample: {}, beyond the {} bytes of files that it takes",
+                               beyondBytes, limits.bytes));
+    if (beyondNames > 0)
+        lines.push_back(foundation::format("folders left out of a sample, in part or whole: at least {}, beyond the {} "
+                                           "names that it looks at",
+                                           beyondNames, limits.names));
+    return lines;
+}
 
 std::expected<ChannelReading, std::error_code> ChannelTree::read(const ChannelSelection& selection) const
 {

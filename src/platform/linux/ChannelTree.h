@@ -36,21 +36,34 @@ struct ChannelProblem {
     friend auto operator<=>(const ChannelProblem&, const ChannelProblem&) = default;
 };
 
+// What one reading takes at most.
+struct ChannelTreeLimits {
+    std::size_t channels = 4096;
+    std::size_t bytes = std::size_t{2} * 1024 * 1024; // of their files
+    std::size_t names = 65'536; // in folders, whatever they stand for
+};
+
+// What one reading did not take, by the limit that it met.
+struct LeftOutChannels {
+    std::size_t beyondChannels = 0; // files
+    std::size_t beyondBytes = 0; // files
+    std::size_t beyondNames = 0; // folders that were not read to their end; at least so many
+
+    [[nodiscard]] bool isNothing() const noexcept { return beyondChannels + beyondBytes + beyondNames == 0; }
+    // A line for each limit that was met.
+    [[nodiscard]] std::vector<std::string> inWords(const ChannelTreeLimits& limits) const;
+};
+
 struct ChannelReading {
     std::vector<ReportingChannel> channels; // in the order of their names
     std::vector<ChannelProblem> problems;
-    std::size_t leftOut = 0; // at least so many files, beyond what one reading takes
+    LeftOutChannels leftOut;
 };
 
 // Any thread.
 class ChannelTree {
 public:
-    // What one reading takes at most.
-    struct Limits {
-        std::size_t channels = 4096;
-        std::size_t bytes = std::size_t{2} * 1024 * 1024; // of their files
-        std::size_t names = 65'536; // in folders, whatever they stand for
-    };
+    using Limits = ChannelTreeLimits;
 
     explicit ChannelTree(std::filesystem::path root) : ChannelTree(std::move(root), Limits()) { }
     ChannelTree(std::filesystem::path root, const Limits& limits) : root_(std::move(root)), limits_(limits) { }

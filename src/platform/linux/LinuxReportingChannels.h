@@ -2,10 +2,10 @@
 // about its sound cards.
 //
 // A subscription is to the question and not to the answer: every sample holds what is there when it is taken, so that
-// channels may come and go. What is wrong in the tree is said once, when it is first met, and again only if it was
-// right in between.
+// channels may come and go.
 #pragma once
 
+#include "platform/linux/ChannelComplaints.h"
 #include "platform/linux/ChannelTree.h"
 #include "platform/linux/ProviderLog.h"
 #include "platform/linux/SoundCards.h"
@@ -15,13 +15,11 @@ namespace platform {
 // One thread at a time for each set of channels; otherwise any. Error codes are the system's (`errno`).
 class LinuxReportingChannels final : public ReportingChannels {
 public:
-    // How many of the channels that are missing are named at once; the rest is counted.
-    static constexpr std::size_t mostNamedProblems = 16;
-
-    LinuxReportingChannels(std::filesystem::path channelRoot, std::filesystem::path soundRoot, ProviderLog log)
-        : tree_(std::move(channelRoot)),
+    LinuxReportingChannels(const std::filesystem::path& channelRoot, std::filesystem::path soundRoot, ProviderLog log,
+                           const ChannelTree::Limits& limits = {})
+        : tree_(channelRoot, limits),
           soundCards_(std::move(soundRoot)),
-          log_(log)
+          complaints_(channelRoot, limits, log)
     {
     }
 
@@ -30,6 +28,7 @@ public:
                                       std::optional<std::string_view> subgroup) override;
     [[nodiscard]] std::size_t channelCount(const ChannelSet& channels) const override;
     Subscribed createSubscription(const ChannelSet& channels) override;
+    // When the tree cannot be read, the sample holds those of the sound cards; the error, where they have none.
     std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
                                                                         const ChannelSet& channels) override;
     std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,
@@ -40,7 +39,7 @@ private:
 
     const ChannelTree tree_;
     const SoundCards soundCards_;
-    const ProviderLog log_;
+    ChannelComplaints complaints_;
 };
 
 } // namespace platform

@@ -60,6 +60,25 @@ TEST(ChannelDifference, TakesAValueThatWentDownForOneThatBeganAnew)
     EXPECT_EQ(difference(simple(INT64_MAX), simple(3)).value, 3) << "it wrapped";
 }
 
+TEST(ChannelDifference, OfAChannelThatWasNotThereIsAllThatItHolds)
+{
+    const auto all = channelDifference({{simple(5, "a")}}, {{simple(6, "a"), simple(7, "b")}});
+    ASSERT_EQ(all.channels.size(), 2U);
+    EXPECT_EQ(all.channels[1].value, 7);
+    EXPECT_TRUE(all.isWhole);
+}
+
+TEST(ChannelDifference, IsNoneOfAChannelThatTheFirstSampleMayNotHaveSeen)
+{
+    const ReportingSample inPart{.channels = {simple(5, "a")}, .isWhole = false};
+    const auto seenTwice = channelDifference(inPart, {{simple(6, "a"), simple(7, "b")}});
+    ASSERT_EQ(seenTwice.channels.size(), 1U);
+    EXPECT_EQ(seenTwice.channels[0].name, "a");
+    EXPECT_EQ(seenTwice.channels[0].value, 1);
+    EXPECT_FALSE(seenTwice.isWhole);
+    EXPECT_EQ(channelDifference({{simple(5, "b")}}, inPart).channels.size(), 1U);
+}
+
 TEST(ChannelDifference, OfMoreThanANumberHoldsIsTheMostItHolds)
 {
     EXPECT_EQ(difference(simple(INT64_MIN), simple(INT64_MAX)).value, INT64_MAX);

@@ -271,8 +271,9 @@ TEST_F(ChannelTreeTest, TakesSoManyChannelsAndCountsTheRest)
         publish(fs::path("amp/Tx/-") / name, "simple\n1\n");
     const ChannelReading reading = ChannelTree(root, {.channels = 3}).read({}).value();
     EXPECT_THAT(reading.channels, ElementsAre(isChannel("a", 1), isChannel("b", 1), isChannel("c", 1)));
-    EXPECT_EQ(reading.leftOut, 2U);
-    EXPECT_EQ(ChannelTree(root, {.channels = 5}).read({})->leftOut, 0U);
+    EXPECT_EQ(reading.leftOut.beyondChannels, 2U);
+    EXPECT_EQ(reading.leftOut.beyondBytes + reading.leftOut.beyondNames, 0U);
+    EXPECT_TRUE(ChannelTree(root, {.channels = 5}).read({})->leftOut.isNothing());
 }
 
 TEST_F(ChannelTreeTest, TakesSoManyBytesAndCountsTheRest)
@@ -284,7 +285,8 @@ TEST_F(ChannelTreeTest, TakesSoManyBytesAndCountsTheRest)
     for (std::size_t index = 0; index < fitting + 2; ++index)
         publish(fs::path("amp/Tx/-") / std::to_string(index), large);
     EXPECT_THAT(read().channels, SizeIs(fitting));
-    EXPECT_EQ(read().leftOut, 2U);
+    EXPECT_EQ(read().leftOut.beyondBytes, 2U);
+    EXPECT_EQ(read().leftOut.beyondChannels, 0U);
 }
 
 TEST_F(ChannelTreeTest, LooksAtSoManyNamesInAllFoldersAndNoMore)
@@ -294,7 +296,9 @@ TEST_F(ChannelTreeTest, LooksAtSoManyNamesInAllFoldersAndNoMore)
     publish("amp/Tx/-/a", "simple\n1\n");
     publish("amp/Tx/-/b", "simple\n1\n");
     publish("amp/Tx/-/c", "simple\n1\n");
-    const auto countWith = [&](std::size_t names) { return ChannelTree(root, {.names = names}).read({})->leftOut; };
+    const auto countWith = [&](std::size_t names) {
+        return ChannelTree(root, {.names = names}).read({})->leftOut.beyondNames;
+    };
     constexpr std::size_t all = 4 * 2 + 3 + 6; // "." and "..", the folders, the files
     EXPECT_EQ(countWith(all), 0U);
     EXPECT_EQ(countWith(all - 1), 1U) << "at least, and it says so";

@@ -14,6 +14,7 @@ namespace fs = std::filesystem;
 using enum LogLevel;
 using support::IsLine;
 using testing::ElementsAre;
+using testing::ElementsAreArray;
 using testing::IsEmpty;
 using testing::Pair;
 using testing::SizeIs;
@@ -137,15 +138,15 @@ TEST_F(LinuxReportingChannelsTest, SayOnceWhatIsWrongWithAFile)
 
 TEST_F(LinuxReportingChannelsTest, NameOnlySoManyFilesAtOnce)
 {
-    for (std::size_t index = 0; index < LinuxReportingChannels::mostNamedProblems + 5; ++index)
+    for (std::size_t index = 0; index < ChannelComplaints::mostNamed + 5; ++index)
         publish("amp/Speaker/-/" + std::to_string(index), "half");
     subscribe("Speaker", std::nullopt);
     const auto lines = log.take();
-    ASSERT_THAT(lines, SizeIs(LinuxReportingChannels::mostNamedProblems + 1));
+    ASSERT_THAT(lines, SizeIs(ChannelComplaints::mostNamed + 1));
     EXPECT_EQ(lines.back().message, "5 more channels are left out");
 }
 
-TEST_F(LinuxReportingChannelsTest, SayOnceThatThereIsMoreThanASampleTakes)
+TEST_F(LinuxReportingChannelsTest, NameTheBoundThatASampleMet)
 {
     std::string large = "histogram\n0 0\n";
     while (large.size() < 30'000)
@@ -154,15 +155,61 @@ TEST_F(LinuxReportingChannelsTest, SayOnceThatThereIsMoreThanASampleTakes)
     for (std::size_t index = 0; index < fitting + 2; ++index)
         publish("amp/Speaker/-/" + std::to_string(index), large);
     const auto subscribed = subscribe("Speaker", std::nullopt);
-    EXPECT_THAT(log.take(),
-                ElementsAre(IsLine(Error, "kerl",
-                                   "2 files are left out: one sample takes 4096 channels and 2097152 "
-                                   "bytes of them")));
+    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl",
+                                               "channels left out of a sample: 2, beyond the 2097152 bytes of files "
+                                               "that it takes")));
     EXPECT_THAT(sample(subscribed).channels, SizeIs(fitting));
     EXPECT_THAT(log.take(), IsEmpty()) << "once";
+
+    LinuxReportingChannels few(root, sound, ProviderLog(log), {.channels = 10});
+    EXPECT_EQ(few.channelCount(*few.copyChannelsInGroup("Speaker", std::nullopt).channels), 10U);
+    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl",
+                                               "channels left out of a sample: 62, beyond the 10 that it takes")));
+
+    LinuxReportingChannels blind(root, sound, ProviderLog(log), {.names = 4});
+    EXPECT_EQ(blind.channelCount(*blind.copyChannelsInGroup("Speaker", std::nullopt).channels), 0U);
+    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl",
+                                               "folders left out of a sample, in part or whole: at least 1, beyond the "
+                                               "4 names that it looks at")));
 }
 
-TEST_F(LinuxReportingChannelsTest, ComeBackBesideTheErrorWhenTheTreeCannotBeRead)
+// What every question meets, as the service asks them when it starts.
+TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
+{
+    fs::create_directories(root);
+    fs::create_directory_symlink(directory.path(), root / "link");
+    for (const char* name : {"a", "b", "c", "d", "e"})
+        publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
+    LinuxReportingChannels bounded(root, sound, ProviderLog(log), {.names = 15});
+    std::vector<ReportingChannels::Subscribed> subscribed;
+    for (const auto& [group, subgroup] : std::vector<std::pair<Name, Name>>{
+             {"QuarnZT4", {}}, {"Speaker", {}}, {{}, "MCA"}, {"Haptics", "Stats"}, {"Rx", {}}, {{}, "HwAudio2"}})
+        if (const auto found = bounded.copyChannelsInGroup(group, subgroup); bounded.channelCount(*found.channels) > 0)
+            subscribed.push_back(bounded.createSubscription(*found.channels));
+    const auto wrong = {
+        IsLine(Error, "kerl", "channel link is left out: Not a directory"),
+        IsLine(Error, "kerl",
+               "folders left out of a sample, in part or whole: at least 1, beyond the 15 names that it looks at")};
+    EXPECT_THAT(log.take(), ElementsAreArray(wrong));
+    ASSERT_THAT(subscribed, SizeIs(2));
+    const auto sampleAll = [&] {
+        for (const auto& each : subscribed)
+            EXPECT_TRUE(bounded.createSamples(*each.subscription, *each.channels));
+    };
+    sampleAll();
+    EXPECT_THAT(log.take(), IsEmpty());
+    fs::remove(root / "link");
+    fs::remove_all(root / "amp/Speaker/MCA");
+    sampleAll();
+    EXPECT_THAT(log.take(), IsEmpty());
+    fs::create_directory_symlink(directory.path(), root / "link");
+    for (const char* name : {"a", "b", "c", "d", "e"})
+        publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
+    sampleAll();
+    EXPECT_THAT(log.take(), ElementsAreArray(wrong)) << "again, after it was right in between";
+}
+
+TEST_F(LinuxReportingChannelsTest, OfSoundCardsAreThereThoughTheTreeCannotBeRead)
 {
     support::writeFile(root, "a file in its place");
     fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
@@ -172,9 +219,58 @@ TEST_F(LinuxReportingChannelsTest, ComeBackBesideTheErrorWhenTheTreeCannotBeRead
     ASSERT_NE(found.channels, nullptr);
     EXPECT_EQ(channels.channelCount(*found.channels), 16U);
     const auto subscribed = channels.createSubscription(*found.channels);
-    EXPECT_EQ(channels.createSamples(*subscribed.subscription, *subscribed.channels).error(), ENOTDIR);
+    for (int look = 0; look < 2; ++look)
+        EXPECT_THAT(sample(subscribed).channels, SizeIs(16));
+    const std::string line = "only sound cards have channels: " + root.native() + " cannot be read: Not a directory";
+    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl", line))) << "once";
     fs::remove(root);
     EXPECT_THAT(sample(subscribed).channels, SizeIs(16));
+    support::writeFile(root, "again");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(16));
+    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl", line)));
+}
+
+TEST_F(LinuxReportingChannelsTest, DoNotSayAgainWhatWasWrongBeforeTheTreeCouldNotBeRead)
+{
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    publish("amp/Tx/-/wrong", "simple\n1");
+    const auto subscribed = subscribe("Tx", std::nullopt);
+    EXPECT_THAT(log.take(), SizeIs(1));
+    fs::rename(root, directory.path() / "away");
+    support::writeFile(root, "a file in its place");
+    sample(subscribed);
+    EXPECT_THAT(log.take(), SizeIs(1)) << "the tree";
+    fs::remove(root);
+    fs::rename(directory.path() / "away", root);
+    sample(subscribed);
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(LinuxReportingChannelsTest, AreAnErrorWhereTheTreeCannotBeReadAndNoSoundCardHasAny)
+{
+    publish("amp/Speaker/-/a", "simple\n1\n");
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    fs::remove_all(root);
+    support::writeFile(root, "a file in its place");
+    EXPECT_EQ(channels.createSamples(*subscribed.subscription, *subscribed.channels).error(), ENOTDIR);
+}
+
+// That it is not in the first sample says nothing then: what it holds was not counted in between.
+TEST_F(LinuxReportingChannelsTest, ThatTheFirstSampleCouldNotSeeHaveNoDifference)
+{
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    publish("amp/Tx/-/late cycles", "simple\n1000000\n");
+    const auto subscribed = subscribe("Tx", std::nullopt);
+    fs::rename(root, directory.path() / "away");
+    support::writeFile(root, "a file in its place");
+    const auto before = sample(subscribed);
+    fs::remove(root);
+    fs::rename(directory.path() / "away", root);
+    const auto difference = channels.createDifference(before, sample(subscribed)).value();
+    EXPECT_THAT(difference.channels, SizeIs(16));
+    EXPECT_THAT(valuesOf(difference), testing::Not(testing::Contains(testing::Key("late cycles"))));
 }
 
 TEST_F(LinuxReportingChannelsTest, OfASubscriptionStayItsOwnWhenTheTreeGoesAndComesBack)

@@ -125,6 +125,15 @@ TEST_F(ChannelsCommand, SaysWhyTheTreeCannotBeRead)
     EXPECT_EQ(finished.errors, "kesto: " + root.native() + ": Not a directory\n");
 }
 
+TEST_F(ChannelsCommand, ListsSoundCardsThoughTheTreeCannotBeRead)
+{
+    support::writeFile(root, "");
+    const Finished finished = tool.run({"channels", "--sound", KESTO_RECORDED_SOUND "/usb-headset"});
+    EXPECT_EQ(finished.status, 1);
+    EXPECT_EQ(finished.errors, "kesto: " + root.native() + ": Not a directory\n");
+    EXPECT_THAT(finished.output, HasSubstr("Headset          Tx           pcm0p      sub0 hw_ptr"));
+}
+
 TEST_F(ChannelsCommand, WatchesWhatChanges)
 {
     publish("amp/Tx/-/still", "simple\n5\n");
