@@ -1,10 +1,13 @@
 // The table of the channels, and the arithmetic between what PipeWire tells and what they count.
 #include "kesto-pipewire/DeviceChannels.h"
 
+#include "kesto-pipewire/Text.h"
+
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cmath>
+#include <string_view>
 #include <system_error>
 #include <utility>
 #include <vector>
@@ -26,6 +29,20 @@ const std::vector<std::int64_t> startBounds{0, 1, 2, 5, 10, 20, 50, 100, 200, 50
 const char* cycleGroup(Direction direction)
 {
     return direction == Direction::Output ? "Tx" : "Rx";
+}
+
+// What is left of a name in a file's name and in a report's key: names that differ in nothing else are one.
+std::string essenceOf(std::string_view name)
+{
+    constexpr unsigned char firstPrintable = 0x20;
+    constexpr char deleted = 0x7F;
+    const auto isLost = [](char character) {
+        return character == '_' || character == ' ' || character == '/' || character == deleted
+            || static_cast<unsigned char>(character) < firstPrintable;
+    };
+    std::string essence(name.substr(name.starts_with('.') ? 1 : 0));
+    std::erase_if(essence, isLost);
+    return essence;
 }
 
 // Right after it was returned.
@@ -76,10 +93,26 @@ kesto::Status DeviceChannels::CycleChannels::create(const kesto::Publisher& publ
                      [&] { return workTimes.create(publisher, {driver, group, subgroup, "work"}, "us", workBounds); });
 }
 
-kesto::Status DeviceChannels::create(Device& device, const DeviceDescription& description)
+// No subgroup would mean all devices together.
+std::string DeviceChannels::freeSubgroup(const std::string& name) const
 {
-    const auto& name = description.name;
-    return createAll([&] { return device.cycles.create(publisher_, description.direction, name); },
+    const auto essence = essenceOf(name);
+    const std::string_view wanted = essence.empty() || essence == "-" ? "unnamed" : std::string_view(name);
+    for (std::size_t number = 1;; ++number) {
+        const auto suffix = number == 1 ? "" : "#" + std::to_string(number);
+        auto subgroup = tidyText(wanted, maximumNameBytes - suffix.size()) + suffix;
+        const auto isTaken = [taken = essenceOf(subgroup)](const auto& each) {
+            return essenceOf(each.second.subgroup) == taken;
+        };
+        if (std::ranges::none_of(devices_, isTaken))
+            return subgroup;
+    }
+}
+
+kesto::Status DeviceChannels::create(Device& device)
+{
+    const auto& name = device.subgroup;
+    return createAll([&] { return device.cycles.create(publisher_, device.direction, name); },
                      [&] { return device.states.create(publisher_, {driver, "Speaker", name, "state"}, stateNames); },
                      [&] {
                          return device.startTimes.create(
@@ -105,11 +138,13 @@ DeviceChannels::Device* DeviceChannels::find(DeviceSerial serial)
 
 void DeviceChannels::deviceAppeared(DeviceSerial serial, const DeviceDescription& description)
 {
+    devices_.erase(serial);
     Device device;
     device.direction = description.direction;
-    if (const auto status = create(device, description); status != kesto::Status::Ok)
+    device.subgroup = freeSubgroup(description.name);
+    if (const auto status = create(device); status != kesto::Status::Ok)
         diagnostics_.detail("no statistics of {}: {}", description.name, reasonOf(status));
-    devices_.insert_or_assign(serial, std::move(device));
+    devices_.emplace(serial, std::move(device));
 }
 
 void DeviceChannels::deviceStateChanged(DeviceSerial serial, DeviceState state, Moment when)

@@ -3,6 +3,7 @@
 //
 // Some channels are about all devices together and there from the beginning: the service follows only groups in which
 // there is a channel when it starts. The others are a device's, in a subgroup of its name, and come and go with it.
+// Devices may share a name: the second one's subgroup is "name#2", and stays that though the first one goes.
 //
 // A device that cannot be published, for want of a folder or of room, is left aside: reporting goes on without it.
 #pragma once
@@ -47,6 +48,7 @@ private:
     };
     struct Device {
         Direction direction = Direction::Output;
+        std::string subgroup;
         DeviceState state = DeviceState::Suspended;
         std::optional<Moment> wantedSince; // while it is wanted and has not run since
         CycleChannels cycles;
@@ -55,7 +57,8 @@ private:
     };
 
     [[nodiscard]] kesto::Status createTotals();
-    [[nodiscard]] kesto::Status create(Device& device, const DeviceDescription& description);
+    [[nodiscard]] kesto::Status create(Device& device);
+    [[nodiscard]] std::string freeSubgroup(const std::string& name) const;
     [[nodiscard]] Device* find(DeviceSerial serial);
     void countRunning();
 

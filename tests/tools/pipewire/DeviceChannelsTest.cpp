@@ -124,6 +124,90 @@ TEST_F(DeviceChannelsTest, WhoWasPausedForLongTookNoTimeToRun)
     EXPECT_THAT(file("StateTransitionTimes_ms/speaker/to Running"), testing::Not(HasSubstr(" 1\n")));
 }
 
+TEST_F(DeviceChannelsTest, DevicesOfOneNameHaveChannelsOfTheirOwn)
+{
+    channels.deviceAppeared(32, {Direction::Output, "speaker"});
+    channels.deviceAppeared(33, {Direction::Input, "speaker"});
+    channels.deviceCycle(sink, {});
+    for (int cycle = 0; cycle < 2; ++cycle)
+        channels.deviceCycle(32, {});
+    for (int cycle = 0; cycle < 3; ++cycle)
+        channels.deviceCycle(33, {});
+    channels.deviceStateChanged(33, DeviceState::Running, now);
+
+    EXPECT_EQ(file("Tx/speaker/cycles"), "simple\n1\n");
+    EXPECT_EQ(file("Tx/speaker#2/cycles"), "simple\n2\n");
+    EXPECT_EQ(file("Rx/speaker#3/cycles"), "simple\n3\n");
+    EXPECT_THAT(file("Speaker/speaker/state"), HasSubstr("Running 0 "));
+    EXPECT_THAT(file("Speaker/speaker#2/state"), HasSubstr("Running 0 "));
+    EXPECT_THAT(file("Speaker/speaker#3/state"), HasSubstr("Running 1 "));
+}
+
+TEST_F(DeviceChannelsTest, WhenTheFirstOfANameGoesTheOthersKeepTheirChannels)
+{
+    channels.deviceAppeared(32, {Direction::Output, "speaker"});
+    channels.deviceCycle(32, {});
+    channels.deviceGone(sink);
+    channels.deviceCycle(32, {});
+
+    EXPECT_EQ(file("Tx/speaker/cycles"), "no file");
+    EXPECT_EQ(file("Tx/speaker#2/cycles"), "simple\n2\n");
+    channels.deviceAppeared(33, {Direction::Output, "speaker"});
+    EXPECT_EQ(file("Tx/speaker/cycles"), "simple\n0\n") << "its name is free again";
+    channels.deviceGone(32);
+    EXPECT_EQ(file("Tx/speaker#2/cycles"), "no file");
+    EXPECT_EQ(file("Tx/speaker/cycles"), "simple\n0\n");
+}
+
+TEST_F(DeviceChannelsTest, ADeviceThatIsReallyCalledLikeASecondOneIsNotMixedUpWithIt)
+{
+    channels.deviceAppeared(32, {Direction::Output, "speaker#2"});
+    channels.deviceAppeared(33, {Direction::Output, "speaker"});
+    channels.deviceCycle(33, {});
+
+    EXPECT_EQ(file("Tx/speaker#2/cycles"), "simple\n0\n");
+    EXPECT_EQ(file("Tx/speaker#3/cycles"), "simple\n1\n");
+}
+
+TEST_F(DeviceChannelsTest, NamesThatNeitherFilesNorReportsTellApartAreOne)
+{
+    DeviceSerial serial = 40;
+    for (const auto* name : {"hdmi/left", "hdmi_left", "hdmi left", "hdmi\nleft", "hdmileft"})
+        channels.deviceAppeared(serial++, {Direction::Output, name});
+    channels.deviceCycle(42, {});
+
+    EXPECT_EQ(file("Tx/hdmi_left/cycles"), "simple\n0\n");
+    EXPECT_EQ(file("Tx/hdmi_left#2/cycles"), "simple\n0\n");
+    EXPECT_EQ(file("Tx/hdmi left#3/cycles"), "simple\n1\n");
+    EXPECT_EQ(file("Tx/hdmi_left#4/cycles"), "simple\n0\n");
+    EXPECT_EQ(file("Tx/hdmileft#5/cycles"), "simple\n0\n");
+}
+
+TEST_F(DeviceChannelsTest, ADeviceWithoutAUsableNameIsNotCountedAsAllTogether)
+{
+    channels.deviceAppeared(40, {Direction::Output, ""});
+    channels.deviceAppeared(41, {Direction::Output, "-"});
+    channels.deviceAppeared(42, {Direction::Output, "_"});
+    channels.deviceCycle(41, {});
+    channels.deviceGone(40);
+
+    EXPECT_EQ(file("Tx/-/cycles"), "simple\n1\n");
+    EXPECT_EQ(file("Tx/unnamed/cycles"), "no file");
+    EXPECT_EQ(file("Tx/unnamed#2/cycles"), "simple\n1\n");
+    EXPECT_EQ(file("Tx/unnamed#3/cycles"), "simple\n0\n");
+}
+
+TEST_F(DeviceChannelsTest, TheLongestNamesAreToldApartToo)
+{
+    const std::string longest(255, 'n');
+    channels.deviceAppeared(40, {Direction::Output, longest});
+    channels.deviceAppeared(41, {Direction::Output, longest});
+    channels.deviceCycle(41, {});
+
+    EXPECT_EQ(file("Tx/" + longest + "/cycles"), "simple\n0\n");
+    EXPECT_EQ(file("Tx/" + std::string(253, 'n') + "#2/cycles"), "simple\n1\n");
+}
+
 TEST_F(DeviceChannelsTest, WhatIsSaidOfUnknownDevicesIsIgnored)
 {
     channels.deviceCycle(99, {});
