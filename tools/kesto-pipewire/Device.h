@@ -32,7 +32,8 @@ struct NodeCycle {
 
 struct Cycle {
     std::int64_t began = 0; // nanoseconds of CLOCK_MONOTONIC
-    std::vector<NodeCycle> nodes{}; // the driver, late when any other node is, and those that follow it
+    std::optional<NodeCycle> driver{}; // which has not been late by itself
+    std::vector<NodeCycle> followers{};
 };
 
 // Hears of devices: `deviceAppeared`, any number of others, `deviceGone`. What is told may repeat what is known.

@@ -92,7 +92,7 @@ void Graph::removeNode(ObjectID id, Moment when)
     const auto& node = removed.mapped();
     streams_ -= node.direction.has_value();
     devices_ -= node.isDevice;
-    runningStreams_ -= node.isRunning;
+    runningStreams_ -= node.direction && node.isRunning;
     if (node.hasAppeared)
         listener_.gone(node.serial, when);
     if (node.isDevice)
@@ -170,6 +170,8 @@ void Graph::setRunning(ObjectID id, bool running, Moment when)
         return;
     node->isRunning = running;
     runningStreams_ += running ? 1 : -1;
+    if (running)
+        node->setOffAt = when;
     listener_.runningChanged(node->serial, running, when);
 }
 
@@ -187,27 +189,48 @@ void Graph::setFormat(ObjectID id, const StreamFormat& format, Moment when)
 
 void Graph::setDeviceState(ObjectID id, DeviceState state, Moment when)
 {
-    if (const auto found = nodes_.find(id); found != nodes_.end() && found->second.isDevice)
-        deviceListener_.deviceStateChanged(found->second.serial, state, when);
+    const auto found = nodes_.find(id);
+    if (found == nodes_.end() || !found->second.isDevice)
+        return;
+    auto& node = found->second;
+    const bool runs = state == DeviceState::Running;
+    if (runs && !node.isRunning)
+        node.setOffAt = when;
+    node.isRunning = runs;
+    deviceListener_.deviceStateChanged(node.serial, state, when);
 }
 
 void Graph::noteCycle(const Cycle& cycle)
 {
-    for (const auto& part : cycle.nodes) {
-        if (part.isLate)
-            noteLateCycle(part.node, cycle.began);
-        if (const auto found = nodes_.find(part.node); found != nodes_.end() && found->second.isDevice)
-            deviceListener_.deviceCycle(found->second.serial, part);
+    const auto began = momentOfMonotonic(cycle.began);
+    bool anyIsLate = false;
+    for (auto part : cycle.followers) {
+        part.isLate = part.isLate && !isSettingOff(part.node, began);
+        anyIsLate = anyIsLate || part.isLate;
+        if (const auto* stream = part.isLate ? appearedStream(part.node) : nullptr)
+            listener_.cycleWasLate(stream->serial, began);
+        tellCycle(part);
+    }
+    if (auto driver = cycle.driver) {
+        driver->isLate = anyIsLate;
+        tellCycle(*driver);
     }
 }
 
-void Graph::noteLateCycle(ObjectID id, std::int64_t began)
+// Of what is neither stream nor device, and of what is gone, nobody knows: it takes part.
+bool Graph::isSettingOff(ObjectID id, Moment when) const
 {
-    auto* node = appearedStream(id);
-    if (!node || began <= node->lastLateCycle)
-        return;
-    node->lastLateCycle = began;
-    listener_.cycleWasLate(node->serial, momentOfMonotonic(began));
+    const auto found = nodes_.find(id);
+    if (found == nodes_.end() || !(found->second.direction || found->second.isDevice))
+        return false;
+    const auto& setOffAt = found->second.setOffAt;
+    return !setOffAt || when.uptime < setOffAt->uptime + startUpTime;
+}
+
+void Graph::tellCycle(const NodeCycle& cycle)
+{
+    if (const auto found = nodes_.find(cycle.node); found != nodes_.end() && found->second.isDevice)
+        deviceListener_.deviceCycle(found->second.serial, cycle);
 }
 
 std::string Graph::devicesOf(ObjectID id) const

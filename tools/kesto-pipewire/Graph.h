@@ -22,6 +22,8 @@ constexpr std::size_t maximumStreams = 512;
 constexpr std::size_t maximumDevices = 128;
 constexpr std::size_t maximumObjects = 16384; // of each kind
 
+constexpr double startUpTime = 0.2; // seconds; cycles that a node misses so soon after setting off are no fault
+
 // Who a program says it is, on its client object, its node or both.
 struct Identity {
     std::string applicationID{}; // `application.id`
@@ -66,11 +68,9 @@ public:
     void setFormat(ObjectID node, const StreamFormat& format, Moment when);
     // Of nodes that are no devices it is ignored.
     void setDeviceState(ObjectID node, DeviceState state, Moment when);
-    // Tells the devices of their cycles and the streams of those that they were late in.
+    // Tells the devices of their cycles and the streams of those that they were late in; a driver was late when any
+    // that follows it was. It is told in arrears: an ID may be another node's by now, whose cycles began later.
     void noteCycle(const Cycle& cycle);
-    // A node was late in the cycle that began then, in nanoseconds of CLOCK_MONOTONIC; repeated for one cycle, it
-    // counts once. It is told in arrears: the ID may be another node's by now, whose cycles began later.
-    void noteLateCycle(ObjectID node, std::int64_t began);
 
     [[nodiscard]] bool anyStreamRuns() const noexcept { return runningStreams_ > 0; }
     // Objects left aside because there were too many.
@@ -85,7 +85,7 @@ private:
         std::optional<ObjectID> client;
         bool hasAppeared = false;
         bool isRunning = false;
-        std::int64_t lastLateCycle = 0; // when it began
+        std::optional<Moment> setOffAt{}; // when it last began to run
     };
     struct Link {
         ObjectID outputNode = 0;
@@ -95,8 +95,10 @@ private:
 
     [[nodiscard]] bool hasRoom(std::size_t count, std::size_t maximum);
     [[nodiscard]] Node* appearedStream(ObjectID node);
+    [[nodiscard]] bool isSettingOff(ObjectID node, Moment when) const;
     [[nodiscard]] std::string applicationOf(const Node& node, const Identity& own) const;
     [[nodiscard]] std::string devicesOf(ObjectID node) const;
+    void tellCycle(const NodeCycle& cycle);
     void tellLinks(ObjectID node, Moment when);
     void tellDevices(ObjectID node, Moment when);
     void tellWanted(ObjectID node, Moment when);

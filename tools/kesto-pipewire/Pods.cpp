@@ -72,29 +72,44 @@ std::string shortName(const spa_type_info* types, std::uint32_t type)
     return name ? name : "unknown";
 }
 
-// One node's part of a cycle: its ID, its name, four times and how far it came.
-std::optional<NodeCycle> readNodeCycle(const spa_pod& block)
+// One node's part of a cycle, as the profiler tells it.
+struct Block {
+    std::int32_t node = 0;
+    std::int64_t signalBefore = 0; // when it was last told to begin, before this one
+    std::int64_t signal = 0; // when it was told to
+    std::int64_t awake = 0; // when it did
+    std::int64_t finish = 0;
+    std::int32_t status = 0; // how far it came
+};
+
+std::optional<Block> readBlock(const spa_pod& pod)
 {
     spa_pod_parser parser;
     spa_pod_frame frame;
-    std::int32_t node = 0;
+    Block block;
     const char* name = nullptr;
-    std::array<std::int64_t, 4> times{}; // the signal before, the signal, awake, finish
-    std::int32_t status = 0;
-    spa_pod_parser_pod(&parser, &block);
-    if (spa_pod_parser_push_struct(&parser, &frame) < 0 || spa_pod_parser_get_int(&parser, &node) < 0
+    spa_pod_parser_pod(&parser, &pod);
+    if (spa_pod_parser_push_struct(&parser, &frame) < 0 || spa_pod_parser_get_int(&parser, &block.node) < 0
         || spa_pod_parser_get_string(&parser, &name) < 0)
         return std::nullopt;
-    for (auto& time : times)
-        if (spa_pod_parser_get_long(&parser, &time) < 0)
+    for (auto* time : {&block.signalBefore, &block.signal, &block.awake, &block.finish})
+        if (spa_pod_parser_get_long(&parser, time) < 0)
             return std::nullopt;
-    if (spa_pod_parser_get_int(&parser, &status) < 0)
+    if (spa_pod_parser_get_int(&parser, &block.status) < 0)
         return std::nullopt;
-    NodeCycle cycle{.node = static_cast<ObjectID>(node), .isLate = status != cycleFinished};
-    const auto [signalBefore, signal, awake, finish] = times;
-    if (awake > 0 && finish >= awake) // of a node that has not finished they are the cycle's before
-        cycle.workNanoseconds = finish - awake;
-    return cycle;
+    return block;
+}
+
+// Times of which one is not of this cycle, since the node has not come so far in it, are the cycle's before.
+std::optional<std::int64_t> workOf(const Block& block)
+{
+    const bool isOfThisCycle = block.awake > 0 && block.awake >= block.signal && block.finish >= block.awake;
+    return isOfThisCycle ? std::optional(block.finish - block.awake) : std::nullopt;
+}
+
+NodeCycle nodeCycleOf(const Block& block, bool isLate)
+{
+    return {.node = static_cast<ObjectID>(block.node), .workNanoseconds = workOf(block), .isLate = isLate};
 }
 
 // The clock's flags, ID and name, and then when the cycle began.
@@ -179,22 +194,22 @@ void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>&
             return;
         Cycle cycle;
         std::optional<std::int64_t> began;
-        std::optional<NodeCycle> driver;
+        std::optional<Block> driver;
         forEachProperty(object, [&](std::uint32_t key, const spa_pod& value) {
             if (key == SPA_PROFILER_clock)
                 began = readCycleBegin(value);
             else if (key == SPA_PROFILER_driverBlock)
-                driver = readNodeCycle(value);
+                driver = readBlock(value);
             else if (key == SPA_PROFILER_followerBlock)
-                if (const auto follower = readNodeCycle(value))
-                    cycle.nodes.push_back(*follower);
+                if (const auto follower = readBlock(value))
+                    cycle.followers.push_back(nodeCycleOf(*follower, follower->status != cycleFinished));
         });
-        if (!began)
+        if (!began || (driver && driver->signal == driver->signalBefore))
             return;
         cycle.began = *began;
-        if (driver) { // whose own status is that of a cycle which is just being told
-            driver->isLate = std::ranges::any_of(cycle.nodes, &NodeCycle::isLate);
-            cycle.nodes.push_back(*driver);
+        if (driver) { // the clock of a cycle that was missed is the next one's already
+            cycle.began = driver->signal;
+            cycle.driver = nodeCycleOf(*driver, false); // its own status is that of a cycle which is just being told
         }
         tell(cycle);
     });

@@ -23,7 +23,8 @@ namespace kesto_pipewire {
 // The audio format, or nothing when the value holds none, as when the stream is suspended. Any thread.
 [[nodiscard]] std::optional<StreamFormat> readFormat(const spa_pod& format);
 
-// Calls back for every cycle that the profiler tells of. Any thread.
+// Calls back for every cycle that the profiler tells of. What it tells of again without the driver having begun anew,
+// as it does when a driver sets off after a pause or a cycle was missed, is none. Any thread.
 void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& tell);
 
 } // namespace kesto_pipewire

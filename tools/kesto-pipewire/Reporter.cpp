@@ -104,8 +104,6 @@ void Reporter::runningChanged(StreamSerial serial, bool running, Moment when)
     update(serial, when, [&](Stream& stream) {
         if (!running && stream.running.current && !stream.running.told)
             tellChanges(stream, infinity); // it did run, however short
-        if (running && !stream.running.current)
-            stream.setOffAt = when;
         stream.running.observe(running, when);
     });
 }
@@ -128,7 +126,7 @@ void Reporter::devicesChanged(StreamSerial serial, const std::string& devices, M
 void Reporter::cycleWasLate(StreamSerial serial, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
-        if (!stream.running.told || when.uptime < stream.setOffAt.uptime + startUpTime)
+        if (!stream.running.told)
             return;
         if (!stream.episode)
             stream.episode = Episode{when, when, 0};

@@ -25,7 +25,6 @@ namespace kesto_pipewire {
 constexpr double settlingTime = 0.1; // a stop, a device or a format counts when it has lasted that long
 constexpr double volumeInterval = 0.1; // a slider on the move is told no more often
 constexpr double longestHold = 1; // what never settles is told as it is after that long
-constexpr double startUpTime = 0.2; // cycles that a stream misses while it is just starting are no fault
 constexpr double quietTime = 2; // an episode of late cycles ends when there was none for that long
 constexpr double longestEpisode = 60; // trouble without end is told once in that time
 
@@ -92,7 +91,6 @@ private:
         StreamDescription description;
         Moment appearedAt;
         Fact<bool> running;
-        Moment setOffAt; // when it last began to run, be it after a dip
         Fact<std::optional<double>> volume;
         Fact<std::optional<StreamFormat>> format;
         Fact<std::string> devices;

@@ -42,7 +42,7 @@ public:
     virtual void formatChanged(StreamSerial stream, const StreamFormat& format, Moment when) = 0;
     // The names of the devices it is linked with, sorted and joined with ","; empty when there is none.
     virtual void devicesChanged(StreamSerial stream, const std::string& devices, Moment when) = 0;
-    // The stream was not ready in time in the cycle that began then.
+    // The stream was not ready in time in the cycle that began then, and was not just setting off.
     virtual void cycleWasLate(StreamSerial stream, Moment when) = 0;
     virtual void gone(StreamSerial stream, Moment when) = 0;
 };

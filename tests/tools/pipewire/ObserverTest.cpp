@@ -9,11 +9,13 @@
 
 #include <pipewire/pipewire.h>
 
+#include <algorithm>
 #include <csignal>
 #include <functional>
 #include <map>
 #include <memory>
 #include <optional>
+#include <vector>
 
 namespace kesto_pipewire {
 
@@ -28,7 +30,7 @@ struct SeenStream {
     std::optional<double> volume{};
     std::optional<StreamFormat> format{};
     std::string devices{};
-    int lateCycles = 0;
+    std::vector<double> lateCycles{}; // when they began
     bool isGone = false;
     // When it last began or ceased to run, changed its volume, and went.
     double runningChangedAt = 0;
@@ -70,9 +72,9 @@ public:
         at(serial).devices = devices;
         changed_();
     }
-    void cycleWasLate(StreamSerial serial, Moment) override
+    void cycleWasLate(StreamSerial serial, Moment when) override
     {
-        ++at(serial).lateCycles;
+        at(serial).lateCycles.push_back(when.secondsSince1970);
         changed_();
     }
     void gone(StreamSerial serial, Moment when) override
@@ -127,6 +129,16 @@ protected:
         awaited = nullptr;
         return !timedOut;
     }
+    void letTimePass(double seconds)
+    {
+        auto timer = loop->addTimer([this] { loop->quit(); });
+        loop->arm(timer, seconds);
+        loop->run();
+    }
+    [[nodiscard]] std::ptrdiff_t lateCyclesOfDevices() const
+    {
+        return std::ranges::count_if(devices.cycles(), &NodeCycle::isLate);
+    }
     [[nodiscard]] SeenStream& first() { return seen.streams.at(0); }
     // Whether the stream of that number, the first being 0, runs and all is known of it.
     [[nodiscard]] bool plays(std::size_t number) const
@@ -144,7 +156,7 @@ protected:
 
     HeadlessPipeWire server;
     Diagnostics diagnostics{false};
-    RecordingDevices devices;
+    RecordingDevices devices{[this] { quitWhenItHappened(); }};
     SeenStreams seen{[this] { quitWhenItHappened(); }};
     std::optional<Loop> loop;
     Source timeout;
@@ -300,7 +312,7 @@ TEST_F(ObserverTest, AStreamThatDoesNotKeepPaceIsLate)
     const auto player = server.playTone("Music");
     ASSERT_TRUE(happens([this] { return plays(0); }));
     player->kill(SIGSTOP);
-    ASSERT_TRUE(happens([this] { return first().lateCycles >= 5; }));
+    ASSERT_TRUE(happens([this] { return first().lateCycles.size() >= 5; }));
     player->kill(SIGCONT);
     player->write("pause\n");
 
@@ -313,12 +325,58 @@ TEST_F(ObserverTest, ADeviceIsSeenAtWorkAndInTrouble)
     const auto player = server.playTone("Music");
     ASSERT_TRUE(happens([this] { return plays(0); }));
     player->kill(SIGSTOP);
-    ASSERT_TRUE(happens([this] { return first().lateCycles >= 5; }));
+    ASSERT_TRUE(happens([this] { return first().lateCycles.size() >= 5; }));
     player->kill(SIGCONT);
 
     const auto news = devices.news();
     for (const auto* what : {" output null-sink", " wanted", " running", " cycle", " late cycle"})
         EXPECT_THAT(news, testing::Contains(testing::EndsWith(what)));
+}
+
+TEST_F(ObserverTest, APauseIsNeitherWorkNorLateness)
+{
+    constexpr double pause = 0.5;
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    std::vector<double> resumptions;
+    const auto playOn = [this] {
+        const auto heard = devices.cycles().size();
+        return happens([this, heard] { return devices.cycles().size() >= heard + 60; });
+    };
+    for (int turn = 0; turn < 3; ++turn) {
+        ASSERT_TRUE(playOn());
+        player->write("pause\n");
+        ASSERT_TRUE(happens([this] { return !first().runs; }));
+        letTimePass(pause);
+        player->write("play\n");
+        ASSERT_TRUE(happens([this] { return first().runs; }));
+        resumptions.push_back(first().runningChangedAt);
+    }
+    ASSERT_TRUE(playOn());
+
+    std::int64_t longestWork = 0;
+    for (const auto& cycle : devices.cycles())
+        longestWork = std::max(longestWork, cycle.workNanoseconds.value_or(0));
+    EXPECT_LT(static_cast<double>(longestWork) / 1e9, pause / 2);
+    EXPECT_EQ(lateCyclesOfDevices(), std::ssize(first().lateCycles)) << "if the machine is busy, there may be some";
+    for (const auto resumption : resumptions)
+        EXPECT_THAT(first().lateCycles,
+                    testing::Each(testing::AnyOf(testing::Lt(resumption - pause / 2),
+                                                 testing::Gt(resumption + startUpTime / 2))));
+}
+
+TEST_F(ObserverTest, AMissedCycleIsOneOfTheDevice)
+{
+    observer->start();
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    ASSERT_TRUE(happens([this] { return devices.cycles().size() >= 30; }));
+    player->kill(SIGSTOP);
+    ASSERT_TRUE(happens([this] { return first().lateCycles.size() >= 20; }));
+    player->kill(SIGCONT);
+
+    EXPECT_EQ(lateCyclesOfDevices(), std::ssize(first().lateCycles));
 }
 
 TEST_F(ObserverTest, WhenPipeWireDiesItsStreamsGoAndItsSuccessorsAreSeen)

@@ -284,24 +284,32 @@ TEST(ReadFormatTest, WhatIsNoFormatOfSoundIsNone)
 
 // ---- Cycles ----
 
+struct Times {
+    std::int64_t signalBefore = 0;
+    std::int64_t signal = 0;
+    std::int64_t awake = 0;
+    std::int64_t finish = 0;
+};
+
 // A profile of cycles, each with its clock, its driver and its followers, as the server's profiler makes it.
 class ProfileBuilder : public PodBuilder {
 public:
     ProfileBuilder() { structure(); }
 
+    // By the clock.
     ProfileBuilder& cycle(std::int64_t began)
     {
         object(SPA_TYPE_OBJECT_Profiler);
         key(SPA_PROFILER_clock).structure().integer(0).integer(0).text("clock").wide(began).wide(0).end();
         return *this;
     }
-    ProfileBuilder& driver(std::int32_t node, std::int64_t awake, std::int64_t finish)
+    ProfileBuilder& driver(std::int32_t node, const Times& times)
     {
-        return block(SPA_PROFILER_driverBlock, node, awake, finish, 2);
+        return block(SPA_PROFILER_driverBlock, node, times, 2);
     }
-    ProfileBuilder& follower(std::int32_t node, std::int32_t status, std::int64_t awake = 0, std::int64_t finish = 0)
+    ProfileBuilder& follower(std::int32_t node, std::int32_t status, const Times& times = {})
     {
-        return block(SPA_PROFILER_followerBlock, node, awake, finish, status);
+        return block(SPA_PROFILER_followerBlock, node, times, status);
     }
     ProfileBuilder& endCycle()
     {
@@ -310,25 +318,31 @@ public:
     }
 
 private:
-    ProfileBuilder& block(std::uint32_t kind, std::int32_t node, std::int64_t awake, std::int64_t finish,
-                          std::int32_t status)
+    ProfileBuilder& block(std::uint32_t kind, std::int32_t node, const Times& times, std::int32_t status)
     {
-        key(kind).structure().integer(node).text("name").wide(0).wide(0).wide(awake).wide(finish).integer(status).end();
+        key(kind).structure().integer(node).text("name");
+        for (const auto time : {times.signalBefore, times.signal, times.awake, times.finish})
+            wide(time);
+        integer(status).end();
         return *this;
     }
 };
 
-// Such as "1000: 41 late, 30 50 ns".
+// Such as "1000: 41 late, driver 30 50 ns".
 std::vector<std::string> cycles(const spa_pod& profile)
 {
     std::vector<std::string> told;
     readCycles(profile, [&told](const Cycle& cycle) {
         auto text = std::to_string(cycle.began) + ":";
-        for (const auto& [node, work, isLate] : cycle.nodes) {
-            text += (text.ends_with(':') ? " " : ", ") + std::to_string(node);
-            text += work ? " " + std::to_string(*work) + " ns" : "";
-            text += isLate ? " late" : "";
-        }
+        const auto add = [&text](const std::string& what, const NodeCycle& part) {
+            text += (text.ends_with(':') ? " " : ", ") + what + std::to_string(part.node);
+            text += part.workNanoseconds ? " " + std::to_string(*part.workNanoseconds) + " ns" : "";
+            text += part.isLate ? " late" : "";
+        };
+        for (const auto& follower : cycle.followers)
+            add("", follower);
+        if (cycle.driver)
+            add("driver ", *cycle.driver);
         told.push_back(text);
     });
     return told;
@@ -343,21 +357,83 @@ TEST(ReadCyclesTest, WhoHasNotFinishedIsLate)
     EXPECT_THAT(cycles(profile.build()), ElementsAre("1000: 40, 41 late", "2000: 40 late, 41 late"));
 }
 
-TEST(ReadCyclesTest, TheDriverIsLateWhenAnyOfItsFollowersIs)
+TEST(ReadCyclesTest, ACycleBeginsWhenItsDriverIsToldTo)
 {
     ProfileBuilder profile;
-    profile.cycle(1000).driver(30, 1000, 1050).follower(40, 3).endCycle();
-    profile.cycle(2000).driver(30, 2000, 2060).follower(40, 3).follower(41, 1).endCycle();
+    profile.cycle(1000).driver(30, {900, 1001, 1002, 1050}).follower(40, 3).endCycle();
+    profile.cycle(2000).follower(40, 3).endCycle();
 
-    EXPECT_THAT(cycles(profile.build()), ElementsAre("1000: 40, 30 50 ns", "2000: 40, 41 late, 30 60 ns late"));
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("1001: 40, driver 30 48 ns", "2000: 40"));
 }
 
 TEST(ReadCyclesTest, WorkIsFromAwakeToFinishWhereBothAreOfThisCycle)
 {
     ProfileBuilder profile;
-    profile.cycle(1000).follower(40, 3, 1010, 1030).follower(41, 1, 1010, 500).follower(42, 3, 0, 700).endCycle();
+    profile.cycle(1000)
+        .follower(40, 3, {1001, 1002, 1010, 1030})
+        .follower(41, 1, {1001, 1002, 1010, 500})
+        .follower(42, 3, {0, 0, 0, 700})
+        .follower(43, 1, {1001, 1002, 800, 1030})
+        .driver(30, {900, 1001, 850, 5000})
+        .endCycle();
 
-    EXPECT_THAT(cycles(profile.build()), ElementsAre("1000: 40 20 ns, 41 late, 42"));
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("1001: 40 20 ns, 41 late, 42, 43 late, driver 30"));
+}
+
+// In microseconds, as a real server told them. A follower that is paused has no part in what the driver is told when it
+// sets off again; the driver's first cycle is over before the follower is there.
+TEST(ReadCyclesTest, WhatIsToldAgainWhenADriverSetsOffAfterAPauseIsNoCycle)
+{
+    ProfileBuilder profile;
+    profile.cycle(2010656)
+        .driver(29, {1989431, 2010764, 2010867, 2010878})
+        .follower(42, 3, {2010764, 2010766, 2010802, 2010860})
+        .endCycle();
+    profile.cycle(3054813)
+        .driver(29, {2010764, 2010764, 2010867, 3033520})
+        .follower(42, 1, {2010764, 3033520, 3033520, 2010860})
+        .endCycle();
+    profile.cycle(3054813)
+        .driver(29, {2010764, 3033520, 3054934, 3054968})
+        .follower(42, 1, {3033520, 3033520, 3033520, 2010860})
+        .endCycle();
+    profile.cycle(3054813)
+        .driver(29, {3033520, 3054970, 3055085, 3055087})
+        .follower(42, 3, {3054970, 3054972, 3055009, 3055080})
+        .endCycle();
+
+    EXPECT_THAT(cycles(profile.build()),
+                ElementsAre("2010764: 42 58 ns, driver 29 11 ns", "3033520: 42 late, driver 29 34 ns",
+                            "3054970: 42 71 ns, driver 29 2 ns"));
+}
+
+// A device that has just been plugged in.
+TEST(ReadCyclesTest, WhatIsToldBeforeADriversFirstCycleIsNone)
+{
+    ProfileBuilder profile;
+    profile.cycle(6590594).driver(29, {0, 0, 0, 6569300}).follower(48, 1, {0, 6569300, 6569300, 0}).endCycle();
+    profile.cycle(6590594).driver(29, {0, 6569300, 6590665, 6590679}).follower(48, 1).endCycle();
+
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("6569300: 48 late, driver 29 14 ns"));
+}
+
+TEST(ReadCyclesTest, AMissedCycleIsOneThoughItIsToldTwice)
+{
+    ProfileBuilder profile;
+    profile.cycle(1054751)
+        .driver(29, {1013600, 1013600, 1019036, 1033523})
+        .follower(42, 1, {1013600, 1033526, 1033524, 1018984})
+        .endCycle();
+    profile.cycle(1054751)
+        .driver(29, {1013600, 1033523, 1054855, 1054876})
+        .follower(42, 1, {1033523, 1033526, 1033524, 1018984})
+        .endCycle();
+    profile.cycle(1076084)
+        .driver(29, {1033523, 1033523, 1054855, 1054877})
+        .follower(42, 1, {1033523, 1054879, 1054877, 1018984})
+        .endCycle();
+
+    EXPECT_THAT(cycles(profile.build()), ElementsAre("1033523: 42 late, driver 29 21 ns"));
 }
 
 TEST(ReadCyclesTest, WhatIsNoProfileTellsNothing)

@@ -1,4 +1,4 @@
-// A listener that remembers what it heard of devices, as lines of text.
+// A listener that remembers what it heard of devices, as lines of text, and their cycles as they were told.
 #pragma once
 
 #include "kesto-pipewire/Device.h"
@@ -6,6 +6,7 @@
 #include <fmt/format.h>
 
 #include <array>
+#include <functional>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -15,6 +16,8 @@ namespace kesto_pipewire {
 
 class RecordingDevices : public DeviceListener {
 public:
+    explicit RecordingDevices(std::function<void()> changed = [] { }) : changed_(std::move(changed)) { }
+
     void deviceAppeared(DeviceSerial device, const DeviceDescription& description) override
     {
         hear(device, (description.direction == Direction::Output ? "output " : "input ") + description.name);
@@ -30,17 +33,25 @@ public:
     }
     void deviceCycle(DeviceSerial device, const NodeCycle& cycle) override
     {
+        cycles_.push_back(cycle);
         hear(device, cycle.isLate ? "late cycle" : "cycle");
     }
     void deviceGone(DeviceSerial device) override { hear(device, "gone"); }
 
     // What was heard since the last time that it was asked for, such as "30 running".
     std::vector<std::string> news() { return std::exchange(heard_, {}); }
+    [[nodiscard]] const std::vector<NodeCycle>& cycles() const { return cycles_; }
 
 private:
-    void hear(DeviceSerial device, std::string_view what) { heard_.push_back(fmt::format("{} {}", device, what)); }
+    void hear(DeviceSerial device, std::string_view what)
+    {
+        heard_.push_back(fmt::format("{} {}", device, what));
+        changed_();
+    }
 
+    std::function<void()> changed_;
     std::vector<std::string> heard_;
+    std::vector<NodeCycle> cycles_;
 };
 
 } // namespace kesto_pipewire

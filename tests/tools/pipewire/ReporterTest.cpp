@@ -534,39 +534,6 @@ TEST_F(ReporterTest, TroubleWithoutEndIsToldOnceAMinute)
     EXPECT_EQ(cycles, 300);
 }
 
-TEST_F(ReporterTest, CyclesMissedWhileStartingAreNoFault)
-{
-    appearAndRun(stream, 1);
-    news();
-    reporter.cycleWasLate(stream, at(1 + startUpTime - justBefore));
-    pass(20);
-
-    EXPECT_THAT(news(), IsEmpty());
-}
-
-TEST_F(ReporterTest, CyclesMissedWhileSettingOffOnAnotherDeviceAreNoFaultEither)
-{
-    appearAndRun(stream, 1);
-    news();
-    halt(stream, 5);
-    run(stream, 5.002);
-    reporter.cycleWasLate(stream, at(5.03));
-    pass(20);
-
-    EXPECT_THAT(news(), IsEmpty());
-}
-
-TEST_F(ReporterTest, CyclesFromBeforeItAppearedWereAnothers)
-{
-    appearAndRun(stream, 10);
-    news();
-    pass(11);
-    reporter.cycleWasLate(stream, at(9.8)); // told in arrears, under an ID that is this stream's by now
-    pass(20);
-
-    EXPECT_THAT(news(), IsEmpty());
-}
-
 TEST_F(ReporterTest, CyclesOfAStreamThatDoesNotRunAreNoFault)
 {
     appear(stream, 0);
