@@ -2,10 +2,13 @@
 // or an error; a channel has no more than its kind allows; nothing has changed between it and itself; and between
 // nothing and it, what has changed is all of it.
 //
+// So is whom it names as its owner.
+//
 // The input is two files, one behind the other, cut in the middle by a zero byte, so that counters of two samples meet.
 #include "foundation/String.h"
 #include "platform/linux/ChannelDifference.h"
 #include "platform/linux/ChannelFile.h"
+#include "platform/linux/ChannelOwner.h"
 
 #include <algorithm>
 #include <cmath>
@@ -52,14 +55,23 @@ ReportingChannel difference(const platform::ReportingSample& from, const Reporti
     return sample.channels[0];
 }
 
+// As the service does.
+auto read(std::string_view text)
+{
+    const std::size_t size = text.size();
+    const std::string_view owner = platform::takeChannelOwner(text);
+    require(owner.empty() ? text.size() == size : text.size() + platform::channelOwnerLine(owner).size() == size);
+    return platform::parseChannelFile(text);
+}
+
 } // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
     const std::string_view input(reinterpret_cast<const char*>(data), size);
     const std::size_t cut = std::min(input.find('\0'), input.size());
-    const auto first = platform::parseChannelFile(input.substr(0, cut));
-    const auto second = platform::parseChannelFile(input.substr(std::min(cut + 1, input.size())));
+    const auto first = read(input.substr(0, cut));
+    const auto second = read(input.substr(std::min(cut + 1, input.size())));
     for (const auto* channel : {&first, &second}) {
         if (!*channel)
             continue;

@@ -8,6 +8,7 @@
 #include <climits>
 #include <cstdlib>
 #include <fcntl.h>
+#include <new>
 #include <span>
 #include <sys/stat.h>
 
@@ -134,20 +135,23 @@ std::string usualChannelRoot()
     return "/run/kesto/channels";
 }
 
-ChannelFolder::ChannelFolder(std::string root, ChannelPlace place, std::string temporaryName)
+ChannelFolder::ChannelFolder(std::string root, ChannelPlace place, std::string temporaryName,
+                             std::shared_ptr<DriverClaim> claim)
     : root_(std::move(root)),
       place_(std::move(place)),
-      temporaryName_(std::move(temporaryName))
+      temporaryName_(std::move(temporaryName)),
+      claim_(std::move(claim))
 {
 }
 
 ChannelFolder::~ChannelFolder()
 {
+    claim_.reset();
     removeIfEmpty(root_, place_);
 }
 
 int ChannelFolder::open() noexcept
-{
+try {
     if (const int error = makeFolder(AT_FDCWD, root_.c_str()); error != 0)
         return error;
     FileDescriptor folder = openFolder(AT_FDCWD, root_.c_str(), 0);
@@ -158,9 +162,13 @@ int ChannelFolder::open() noexcept
             return error;
         if (const int error = enter(folder, name.c_str()); error != 0)
             return error;
+        if (&name == &place_.front())
+            claim_->renew(folder.get());
     }
     folder_ = std::move(folder);
     return 0;
+} catch (const std::bad_alloc&) {
+    return ENOMEM;
 }
 
 int ChannelFolder::write(const std::string& name, std::string_view text) noexcept
@@ -169,7 +177,9 @@ int ChannelFolder::write(const std::string& name, std::string_view text) noexcep
                                        O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, filePermissions));
     if (!file)
         return errno;
-    int error = writeAll(file.get(), text);
+    int error = writeAll(file.get(), claim_->line());
+    if (error == 0)
+        error = writeAll(file.get(), text);
     if (error == 0 && ::fchmod(file.get(), filePermissions) != 0)
         error = errno;
     if (error == 0 && ::renameat(folder_.get(), temporaryName_.c_str(), folder_.get(), name.c_str()) != 0)
@@ -185,7 +195,7 @@ int ChannelFolder::replace(const std::string& name, std::string_view text) noexc
     constexpr int mostAttempts = 3;
     int error = ENOENT;
     for (int attempt = 0; error == ENOENT && attempt < mostAttempts; ++attempt) {
-        error = folder_ && attempt == 0 ? 0 : open();
+        error = folder_ && attempt == 0 && !claim_->isLost() ? 0 : open();
         if (error == 0)
             error = write(name, text);
     }

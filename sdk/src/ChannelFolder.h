@@ -5,11 +5,13 @@
 // neither to its user nor to the system's administrator is not entered: what is in it could be exchanged at any time.
 #pragma once
 
+#include "DriverClaim.h"
 #include "kesto/channels.h"
 #include "platform/linux/FileDescriptor.h"
 
 #include <array>
 #include <expected>
+#include <memory>
 #include <string>
 #include <string_view>
 
@@ -32,9 +34,10 @@ using ChannelPlace = std::array<std::string, 3>;
 // One folder with channels. One thread at a time. Functions that return an int return 0 or an `errno`.
 class ChannelFolder {
 public:
-    // `temporaryName` is under what name a new file is written: hidden, and of nobody else.
-    ChannelFolder(std::string root, ChannelPlace place, std::string temporaryName);
-    // Removes the folders that are empty.
+    // `temporaryName` is under what name a new file is written: hidden, and of nobody else. The claim is the
+    // publisher's to this driver.
+    ChannelFolder(std::string root, ChannelPlace place, std::string temporaryName, std::shared_ptr<DriverClaim> claim);
+    // Removes the folders that are empty. The claim ends with the last folder that holds it.
     ~ChannelFolder();
     ChannelFolder(const ChannelFolder&) = delete;
     ChannelFolder& operator=(const ChannelFolder&) = delete;
@@ -50,6 +53,7 @@ private:
     const std::string root_;
     const ChannelPlace place_;
     const std::string temporaryName_;
+    std::shared_ptr<DriverClaim> claim_;
     platform::FileDescriptor folder_;
 };
 

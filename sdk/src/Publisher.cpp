@@ -3,12 +3,11 @@
 #include "Publisher.h"
 
 #include "BlockedSignals.h"
-#include "foundation/Format.h"
+#include "platform/linux/ChannelOwner.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <new>
-#include <sys/random.h>
 #include <system_error>
 #include <unistd.h>
 
@@ -21,14 +20,6 @@ constexpr int shareOfTime = 20; // the thread writes for a twentieth of its time
 constexpr milliseconds pauseAfterFailure(5000);
 constexpr milliseconds longestPause(60'000);
 
-std::string temporaryFileName()
-{
-    std::uint64_t number = 0;
-    if (::getrandom(&number, sizeof number, 0) != sizeof number)
-        number = static_cast<std::uint64_t>(::getpid());
-    return foundation::format(".kesto-{:016x}.tmp", number);
-}
-
 int pollTime(ChannelClock::duration pause)
 {
     const auto rounded = std::chrono::ceil<milliseconds>(pause);
@@ -40,7 +31,7 @@ int pollTime(ChannelClock::duration pause)
 kesto_publisher::kesto_publisher(Settings settings, platform::FileDescriptor doorbell)
     : process_(::getpid()),
       settings_(std::move(settings)),
-      temporaryName_(temporaryFileName()),
+      owner_(platform::randomChannelOwner()),
       bell_(std::move(doorbell)),
       refreshed_(ChannelClock::now())
 {
@@ -158,8 +149,14 @@ std::shared_ptr<libkesto::ChannelFolder> kesto_publisher::folder(libkesto::Chann
 {
     std::weak_ptr<libkesto::ChannelFolder>& known = folders_[place];
     auto folder = known.lock();
-    if (!folder)
-        known = folder = std::make_shared<libkesto::ChannelFolder>(settings_.root, std::move(place), temporaryName_);
+    if (folder)
+        return folder;
+    std::weak_ptr<libkesto::DriverClaim>& knownClaim = claims_[place.front()];
+    auto claim = knownClaim.lock();
+    if (!claim)
+        knownClaim = claim = std::make_shared<libkesto::DriverClaim>(owner_);
+    known = folder = std::make_shared<libkesto::ChannelFolder>(
+        settings_.root, std::move(place), platform::channelTemporaryFileName(owner_), std::move(claim));
     return folder;
 }
 
@@ -196,7 +193,9 @@ void kesto_publisher::remove(const kesto_channel& channel) noexcept
     found->folder->remove(found->name);
     timedChannels_ -= channel.isTimed() ? 1 : 0;
     channels_.erase(found);
-    std::erase_if(folders_, [](const auto& folder) { return folder.second.expired(); });
+    const auto hasExpired = [](const auto& known) { return known.second.expired(); };
+    std::erase_if(folders_, hasExpired);
+    std::erase_if(claims_, hasExpired);
 }
 
 kesto_status kesto_publisher::flush() noexcept

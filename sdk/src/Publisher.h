@@ -79,13 +79,14 @@ private:
 
     const pid_t process_; // that made it
     const Settings settings_;
-    const std::string temporaryName_;
+    const std::string owner_; // what it calls itself in its files
     libkesto::ChangeBell bell_;
     libkesto::Counter filesWritten_;
     libkesto::Counter filesFailed_;
     std::atomic<bool> isEnding_ = false;
 
     mutable foundation::Mutex lock_;
+    std::map<std::string, std::weak_ptr<libkesto::DriverClaim>> claims_ KESTO_GUARDED_BY(lock_); // by driver
     std::map<libkesto::ChannelPlace, std::weak_ptr<libkesto::ChannelFolder>> folders_ KESTO_GUARDED_BY(lock_);
     std::vector<Published> channels_ KESTO_GUARDED_BY(lock_);
     std::size_t timedChannels_ KESTO_GUARDED_BY(lock_) = 0;

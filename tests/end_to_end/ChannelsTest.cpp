@@ -2,6 +2,7 @@
 #include "kesto/channels.hpp"
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
+#include "support/Victim.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -11,8 +12,23 @@ namespace end_to_end {
 namespace {
 
 using foundation::Value;
+using testing::AllOf;
 using testing::HasSubstr;
+using testing::Not;
 using testing::SizeIs;
+
+// A session of that service over which `change` happens.
+template <typename Change> void runSession(Kestod& kestod, Change change)
+{
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 42);
+    const auto start = client.call(Start, 42);
+    client.ask(SetServiceType, 7, 42); // answered once the session has started
+    change();
+    client.call(Stop, 42);
+    EXPECT_EQ((*client.nextReply())[0], Value(start));
+    EXPECT_TRUE(client.nextReply());
+}
 
 class ChannelsTest : public testing::Test {
 protected:
@@ -28,18 +44,12 @@ protected:
         EXPECT_EQ(publisher.flush(), kesto::Status::Ok);
     }
 
-    // A session over which `change` happens.
     template <typename Change> void runSession(Change change)
     {
-        WireClient client(kestod.socketPath());
-        client.ask(Create, 42);
-        const auto start = client.call(Start, 42);
-        client.ask(SetServiceType, 7, 42); // answered once the session has started
-        change();
-        EXPECT_EQ(publisher.flush(), kesto::Status::Ok);
-        client.call(Stop, 42);
-        EXPECT_EQ((*client.nextReply())[0], Value(start));
-        EXPECT_TRUE(client.nextReply());
+        end_to_end::runSession(kestod, [&] {
+            change();
+            EXPECT_EQ(publisher.flush(), kesto::Status::Ok);
+        });
     }
 
     Kestod kestod;
@@ -79,6 +89,70 @@ TEST_F(ChannelsTest, AHostileTreeCostsItsFilesAndNothingElse)
     EXPECT_THAT(kestod.events("com.quarn.kesto.Cavlet.Simple"), SizeIs(1));
     for (const char* name : {"folder", "half", "link", "pipe"})
         EXPECT_EQ(kestod.countInLog("channel hostile/Tx/-/" + std::string(name) + " is left out"), 1U) << name;
+}
+
+// A driver "dock" of a process of its own, with what it counts and the state that it is in.
+class KilledDriverTest : public testing::Test {
+protected:
+    [[nodiscard]] support::Victim dock(const std::string& device) const
+    {
+        return support::Victim([this, device] {
+            static kesto::Publisher publisher;
+            static kesto::SimpleChannel cycles;
+            static kesto::StateChannel state;
+            kesto::PublisherOptions options;
+            options.root = kestod.directory() / "run/channels";
+            const bool isRight = publisher.open(options) == kesto::Status::Ok
+                && cycles.create(publisher, {"dock", "Tx", device, "cycles"}) == kesto::Status::Ok
+                && state.create(publisher, {"dock", "Speaker", device, "state"}, {"Idle", "Running"})
+                    == kesto::Status::Ok;
+            cycles.add(1000);
+            state.enter(1);
+            return isRight && publisher.flush() == kesto::Status::Ok;
+        });
+    }
+    // What all events of sessions tell of drivers.
+    [[nodiscard]] std::string told()
+    {
+        std::string text;
+        for (const char* kind : {"Simple", "State"})
+            for (const auto& event : kestod.events(std::string("com.quarn.kesto.Cavlet.") + kind))
+                text += event.payload;
+        return text;
+    }
+
+    Kestod kestod;
+};
+
+TEST_F(KilledDriverTest, WhatItLeftIsNotReported)
+{
+    support::Victim killed = dock("old");
+    const support::Victim living = dock("new");
+    kestod.start();
+    runSession(kestod, [] { });
+    EXPECT_THAT(told(), AllOf(HasSubstr("dock_Speaker_old_State_state"), HasSubstr("dock_Speaker_new_State_state")));
+    runSession(kestod, [&] { killed.kill(); });
+    runSession(kestod, [] { });
+    const auto states = kestod.events("com.quarn.kesto.Cavlet.State");
+    ASSERT_THAT(states, SizeIs(3));
+    for (const std::size_t afterwards : {1U, 2U})
+        EXPECT_THAT(states[afterwards].payload,
+                    AllOf(Not(HasSubstr("dock_Speaker_old")), HasSubstr("dock_Speaker_new_State_state")));
+    EXPECT_EQ(kestod.countInLog("is left out"), 0U);
+}
+
+TEST_F(KilledDriverTest, ItsSuccessorIsReportedInItsPlace)
+{
+    const auto folder = kestod.directory() / "run/channels/dock";
+    support::Victim killed = dock("old");
+    kestod.start();
+    killed.kill();
+    ASSERT_TRUE(std::filesystem::exists(folder / "Tx/old/cycles"));
+    const support::Victim next = dock("new");
+    EXPECT_FALSE(std::filesystem::exists(folder / "Tx/old"));
+    EXPECT_FALSE(std::filesystem::exists(folder / "Speaker/old"));
+    runSession(kestod, [] { });
+    EXPECT_THAT(told(), AllOf(HasSubstr("dock_Speaker_new_State_state"), Not(HasSubstr("old"))));
 }
 
 } // namespace

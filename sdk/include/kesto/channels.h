@@ -16,11 +16,15 @@
 //     ...
 //     kesto_publisher_free(publisher);
 //
+// The files of a process that was killed are left out by the service, and cleared away by the next publisher that has a
+// channel of the same driver.
+//
 // The service subscribes to groups once, when it starts, and only to those in which there is a channel then: create
 // channels early, before a client connects. Which groups it knows is in docs/channels.md.
 //
 // Threads and forks: as in kesto.h. Every function may be called from any thread, until the channel is destroyed or the
-// publisher freed. In a forked child only `kesto_publisher_free` may be called, and leaves the parent's files alone.
+// publisher freed. In a forked child only `kesto_publisher_free` may be called, and leaves the parent's files alone. A
+// child that lives on without executing another program keeps the files of a parent that was killed alive.
 #ifndef KESTO_CHANNELS_H
 #define KESTO_CHANNELS_H
 

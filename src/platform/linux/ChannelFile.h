@@ -9,6 +9,8 @@
 // transitions, residency and duty cycle of every state. One blank between two fields; only the name of a state and a
 // unit may have blanks of their own. The last line ends like every other: a file that does not is not finished.
 //
+// A line that names the file's owner may stand before all that (ChannelOwner.h); it has been taken off here.
+//
 // Whoever may publish writes it, so nothing in it is believed before it is read in full.
 #pragma once
 

@@ -5,6 +5,7 @@
 #include "foundation/Format.h"
 #include "foundation/String.h"
 #include "platform/linux/ChannelFile.h"
+#include "platform/linux/ChannelOwner.h"
 #include "platform/linux/FileDescriptor.h"
 #include "platform/linux/SystemErrorText.h"
 
@@ -60,6 +61,8 @@ public:
 
     void readFolder(DIR* folder, std::size_t level)
     {
+        if (level == groupLevel)
+            driver_ = {.folder = ::dirfd(folder)};
         for (const Entry& entry : entriesOf(folder)) {
             names_[level] = entry.name;
             if (!foundation::isValidUtf8(entry.name))
@@ -122,7 +125,10 @@ private:
         const auto text = readFile(folder, type);
         if (!text)
             return;
-        auto channel = parseChannelFile(*text);
+        std::string_view content = *text;
+        if (const auto owner = takeChannelOwner(content); !owner.empty() && isGone(owner))
+            return;
+        auto channel = parseChannelFile(content);
         if (!channel)
             return fail(description(channel.error()));
         channel->driver = names_[driverLevel];
@@ -157,6 +163,13 @@ private:
         return std::nullopt;
     }
 
+    bool isGone(std::string_view owner)
+    {
+        if (driver_.owner != owner)
+            driver_ = {driver_.folder, std::string(owner), isChannelOwnerGone(driver_.folder, owner)};
+        return driver_.isOwnerGone;
+    }
+
     static bool isRegular(int file)
     {
         struct stat status = {};
@@ -171,7 +184,15 @@ private:
         reading_.problems.push_back({std::move(path), reason});
     }
 
+    // The driver that is being read. Most of its channels have one owner.
+    struct Driver {
+        int folder = -1;
+        std::string owner = {}; // that was looked up last
+        bool isOwnerGone = false;
+    };
+
     const ChannelSelection& selection_;
+    Driver driver_;
     std::array<std::string, levels> names_; // of the folders on the way, and of the channel
     ChannelReading reading_;
     ChannelTree::Limits left_;

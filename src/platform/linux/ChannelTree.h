@@ -2,8 +2,9 @@
 //
 //     <root>/<driver>/<group>/<subgroup>/<channel>
 //
-// A missing group or subgroup is a folder named "-". Names that begin with a dot belong to nobody: publishers write new
-// files under such names before they put them in place.
+// A missing group or subgroup is a folder named "-". Names that begin with a dot are no channels: publishers write new
+// files under such names before they put them in place. What a publisher left that is gone is not there
+// (ChannelOwner.h).
 //
 // Whoever may publish may put anything there. So every step is taken from the folder before it and none through a link;
 // only what is a regular file is opened, and nothing that would wait; and however much there is, reading ends. The root

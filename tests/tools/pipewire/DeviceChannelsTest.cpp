@@ -30,11 +30,14 @@ protected:
         channels.deviceAppeared(source, {Direction::Input, "microphone"});
     }
 
-    // The text of a channel's file, once it shows what is so now.
+    // The text of a channel's file without the line of its owner, once it shows what is so now.
     [[nodiscard]] std::string file(const std::string& path)
     {
         channels.flush();
         std::ifstream stream(root / "pipewire" / path);
+        std::string owner;
+        std::getline(stream, owner);
+        EXPECT_THAT(owner, testing::AnyOf("", StartsWith("owner "))) << path;
         std::ostringstream text;
         text << stream.rdbuf();
         return stream ? text.str() : "no file";

@@ -1,0 +1,52 @@
+// A process that does something, and lives until a test kills it.
+#pragma once
+
+#include <array>
+#include <csignal>
+#include <functional>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace support {
+
+// To be made before the test has threads: the process is a copy of the test's.
+class Victim {
+public:
+    // `act` tells whether it succeeded; that it does is expected.
+    explicit Victim(const std::function<bool()>& act)
+    {
+        std::array<int, 2> ends{};
+        EXPECT_EQ(::pipe(ends.data()), 0);
+        process_ = ::fork();
+        if (process_ == 0) {
+            const char outcome = act() ? 'y' : 'n';
+            if (::write(ends[1], &outcome, 1) == 1)
+                ::pause();
+            ::_exit(1);
+        }
+        ::close(ends[1]);
+        char outcome = 0;
+        EXPECT_EQ(::read(ends[0], &outcome, 1), 1);
+        EXPECT_EQ(outcome, 'y');
+        ::close(ends[0]);
+    }
+    ~Victim() { kill(); }
+    Victim(const Victim&) = delete;
+    Victim& operator=(const Victim&) = delete;
+
+    // By SIGKILL; it is gone when this returns.
+    void kill()
+    {
+        if (process_ <= 0)
+            return;
+        ::kill(process_, SIGKILL);
+        EXPECT_EQ(::waitpid(process_, nullptr, 0), process_);
+        process_ = 0;
+    }
+
+private:
+    pid_t process_ = 0;
+};
+
+} // namespace support
