@@ -113,10 +113,20 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
                                                                     self.budget_));
             KESTO_LOG(KestoReportingClientCategory(), Default, "session created for reporter {}", reporterID);
         } else {
-            ++self.sessionsRefused_;
+            self.countRefusedSession();
         }
         reply(std::nullopt, true);
     });
+}
+
+// The first is told, so that the log shows it while it can still be helped; a client may make any number of them.
+void KestoReportingClientServerInstance::countRefusedSession()
+{
+    if (sessionsRefused_++ == 0)
+        KESTO_LOG(KestoReportingClientCategory(), Error,
+                  "client {} is refused a session: it may have {}, and all clients {}; further ones are counted until "
+                  "it goes",
+                  processIdentifier_, mostSessions, mostSessionsOfTheService);
 }
 
 void KestoReportingClientServerInstance::setServiceType(AudioServiceType serviceType, std::int64_t reporterID,

@@ -23,12 +23,13 @@ class KestoReportingClientServerInstance final
     : public KestoReportingServiceProtocol,
       public std::enable_shared_from_this<KestoReportingClientServerInstance> {
 public:
-    // More sessions than that are not created, of a client or of all of them; the client is answered as always. The
-    // IDs of all must fit into one frame, which `getAllReporters` answers.
+    // More sessions than that are not created, of a client or of all of them; the client is answered as always, and
+    // the log tells of the first and, when the client goes, how many they were. The IDs of all must fit into one
+    // frame, which `getAllReporters` answers.
     static constexpr std::size_t mostSessions = 10'000;
     static constexpr std::size_t mostSessionsOfTheService = 110'000;
     // What a message takes, times its receivers; it is not delivered to those beyond, but to one at least. The client
-    // is answered as always.
+    // is answered as always, and the log tells in the same way.
     static constexpr std::size_t mostBytesOfADelivery = std::size_t{64} << 20;
 
     KestoReportingClientServerInstance(std::int32_t processIdentifier,
@@ -93,6 +94,8 @@ private:
                             const ReporterIDs& reporterIDs);
     void deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
     [[nodiscard]] static std::size_t mostReceivers(const Message& message, std::size_t wanted);
+    void countRefusedSession();
+    void countRefusedReceivers(std::size_t receivers);
     static void deliverStandalone(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
     static void deliverToSinks(KestoReportingServiceDelegateProtocol& delegate, const Message& message,
                                const Session& session);

@@ -46,18 +46,20 @@ void KestoReportingClientServerInstance::deliverToReporters(KestoReportingServic
                                                             const Message& message, const ReporterIDs& reporterIDs)
 {
     std::size_t room = mostReceivers(message, reporterIDs.size());
+    std::size_t refused = 0;
     for (const std::int64_t reporterID : reporterIDs) {
         const auto session = reporterID == 0 ? nullptr : findReportingSessionForID(reporterID, true);
         if (!session)
             continue;
         if (room == 0) {
-            ++receiversRefused_;
+            ++refused;
             continue;
         }
         --room;
         deliverToSinks(delegate, message, session);
         deliverToSession(message, session);
     }
+    countRefusedReceivers(refused);
 }
 
 void KestoReportingClientServerInstance::deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate,
@@ -67,7 +69,7 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(KestoReportingS
     KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active.size(),
               KestoReportingDescriptionOfSessions(active));
     const std::size_t receivers = std::min(active.size(), mostReceivers(message, active.size()));
-    receiversRefused_ += active.size() - receivers;
+    countRefusedReceivers(active.size() - receivers);
     for (const auto& session : std::span(active).first(receivers)) {
         deliverToSession(message, session);
         deliverToSinks(delegate, message, session);
@@ -82,6 +84,16 @@ std::size_t KestoReportingClientServerInstance::mostReceivers(const Message& mes
     if (wanted <= 1)
         return wanted;
     return std::max<std::size_t>(mostBytesOfADelivery / message.payload.roughBytes(), 1);
+}
+
+void KestoReportingClientServerInstance::countRefusedReceivers(std::size_t receivers)
+{
+    if (receiversRefused_ == 0 && receivers != 0)
+        KESTO_LOG(KestoReportingClientCategory(), Error,
+                  "a message of client {} is not delivered to {} sessions: it may take {} bytes at all who receive it; "
+                  "further ones are counted until the client goes",
+                  processIdentifier_, receivers, mostBytesOfADelivery);
+    receiversRefused_ += receivers;
 }
 
 void KestoReportingClientServerInstance::deliverStandalone(KestoReportingServiceDelegateProtocol& delegate,

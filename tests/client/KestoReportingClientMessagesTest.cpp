@@ -145,7 +145,15 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
     const Dictionary large{{"a", std::string(1'000'000, 'x')}};
     const auto receivers = static_cast<std::int64_t>(most / large.roughBytes());
     ASSERT_LT(receivers, sessions);
+    const auto told = [&](int pid) {
+        return IsLine(Error, "kerc",
+                      "a message of client " + std::to_string(pid) + " is not delivered to "
+                          + std::to_string(sessions - receivers)
+                          + " sessions: it may take 67108864 bytes at all who receive it; further ones are counted "
+                            "until the client goes");
+    };
     EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered)) << "the client is answered as always";
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1));
     EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers)) << "and those that there are not do not count";
     EXPECT_EQ(send(player, Array(reporterIDs)), answeredOnce(delivered));
     EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * sessions)) << "a small one reaches all";
@@ -154,18 +162,20 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
         player.call(StartReportingSessionForID, reporterID);
     EXPECT_EQ(send(recorder, null, large), answeredOnce(delivered));
     EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1002)).Times(1));
+    EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1)) << "the first is told";
 
     platform.analytics.clear();
     player.close();
     recorder.close();
-    const auto refused = [&](int pid) {
+    const auto refused = [&](int pid, std::int64_t times) {
         return IsLine(Error, "kerc",
-                      "messages of client " + std::to_string(pid) + " were not delivered "
-                          + std::to_string(sessions - receivers)
+                      "messages of client " + std::to_string(pid) + " were not delivered " + std::to_string(times)
                           + " times: one may take 67108864 bytes at all who receive it");
     };
-    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1001)).Times(1));
-    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1002)).Times(1));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1001, 2 * (sessions - receivers))).Times(1));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1002, sessions - receivers)).Times(1));
 }
 
 TEST_F(MessagesTest, AreDeliveredToOneSessionWhateverTheirSize)

@@ -207,7 +207,12 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanItMayHave)
     harness.forget();
     EXPECT_EQ(create(most + 1), answeredOnce(succeeded)) << "the client is answered as always";
     EXPECT_EQ(player.session(most + 1), nullptr);
-    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 10001")));
+    const auto refused = IsLine(Error, "kerc",
+                                "client 1001 is refused a session: it may have 10000, and all clients 110000; further "
+                                "ones are counted until it goes");
+    EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 10001"), refused));
+    EXPECT_EQ(create(most + 2), answeredOnce(succeeded));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused).Times(1)) << "the first is told, all count";
     const auto replaced = player.session(1);
     EXPECT_EQ(create(1), answeredOnce(succeeded));
     EXPECT_NE(player.session(1), replaced) << "one that is there already may be replaced";
@@ -222,7 +227,7 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanItMayHave)
     player.close();
     EXPECT_THAT(platform.log.lines("kerc"),
                 testing::Contains(IsLine(
-                    Error, "kerc", "client 1001 was refused 1 sessions: it may have 10000, and all clients 110000")));
+                    Error, "kerc", "client 1001 was refused 2 sessions: it may have 10000, and all clients 110000")));
 }
 
 // All their IDs are answered in one frame.
