@@ -36,10 +36,10 @@ struct KeptFiles {
 class FileSystem {
 public:
     virtual ~FileSystem() = default;
-    // The folder below which diagnostic files are kept. It exists.
+    // The folder below which diagnostic files are kept. It exists when the service starts.
     [[nodiscard]] virtual std::filesystem::path diagnosticLogRoot() const = 0;
     // Makes the folder and those above it that are missing, with exactly these permissions whatever the umask. Those
-    // that exist stay as they are.
+    // that exist stay as they are. The root is made again, as it was, if it has gone.
     [[nodiscard]] virtual std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
                                                                                  unsigned permissions) = 0;
     [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>

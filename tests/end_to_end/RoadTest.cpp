@@ -351,6 +351,21 @@ TEST(InternalRoadTest, PlayingBecomesAVolumeEventAndASummaryFile)
     EXPECT_EQ(files, 1U);
 }
 
+TEST(InternalRoadTest, AFolderForDiagnosticFilesThatWentIsMadeAgain)
+{
+    Kestod kestod(Kestod::Files{{"device.toml", "InternalBuild = true\n"}});
+    kestod.start();
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    client.call(Start, 1);
+    client.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, Array{1});
+    std::filesystem::remove_all(kestod.directory() / "logs");
+    client.call(Stop, 1);
+    client.nextReply();
+    client.nextReply();
+    EXPECT_FALSE(std::filesystem::is_empty(kestod.directory() / "logs/Audio/Reporting"));
+}
+
 TEST(InternalRoadTest, OldSummaryFilesGoWhenThereAreTooMany)
 {
     constexpr std::size_t most = 4096;

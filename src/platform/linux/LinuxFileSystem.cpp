@@ -82,7 +82,34 @@ std::error_code makeIfMissing(int parent, const char* name, unsigned permissions
     return ::fchmodat(parent, name, permissions, AT_SYMLINK_NOFOLLOW) == 0 ? std::error_code() : lastError();
 }
 
+std::optional<unsigned> permissionsOf(const std::filesystem::path& folder)
+{
+    constexpr unsigned permissions = 07777;
+    struct stat status = {};
+    if (::stat(folder.c_str(), &status) != 0)
+        return std::nullopt;
+    return status.st_mode & permissions;
+}
+
 } // namespace
+
+LinuxFileSystem::LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderKeeper* keeper)
+    : diagnosticLogRoot_(std::move(diagnosticLogRoot)),
+      rootPermissions_(permissionsOf(diagnosticLogRoot_)),
+      keeper_(keeper)
+{
+}
+
+std::error_code LinuxFileSystem::makeRootAgain() const
+{
+    if (!rootPermissions_)
+        return std::make_error_code(std::errc::no_such_file_or_directory);
+    std::filesystem::path folder;
+    for (const std::filesystem::path& name : diagnosticLogRoot_)
+        if (const auto error = makeIfMissing(AT_FDCWD, (folder /= name).c_str(), *rootPermissions_))
+            return error;
+    return {};
+}
 
 std::expected<FileDescriptor, std::error_code>
 LinuxFileSystem::openDirectory(const std::filesystem::path& path, std::optional<unsigned> permissionsOfMissing) const
@@ -90,7 +117,15 @@ LinuxFileSystem::openDirectory(const std::filesystem::path& path, std::optional<
     const std::filesystem::path below = path.lexically_relative(diagnosticLogRoot_);
     if (below.empty() || std::ranges::find(below, "..") != below.end())
         return std::unexpected(std::make_error_code(std::errc::invalid_argument));
-    FileDescriptor directory(::open(diagnosticLogRoot_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    const auto openRoot = [this] {
+        return FileDescriptor(::open(diagnosticLogRoot_.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC));
+    };
+    FileDescriptor directory = openRoot();
+    if (!directory && errno == ENOENT && permissionsOfMissing) {
+        if (const auto error = makeRootAgain())
+            return std::unexpected(error);
+        directory = openRoot();
+    }
     if (!directory)
         return std::unexpected(lastError());
     for (const std::filesystem::path& name : below) {

@@ -6,7 +6,8 @@
 // Some folders may be written to by everybody, and what stands there is not to be trusted: a link put in the place of a
 // folder would have the service write, or open to everybody, where its maker may not. So every step below the
 // diagnostic-log root is taken from the folder before it, and none through a link. The root itself may be one: it is
-// the administrator's.
+// the administrator's. If it goes while the service runs, it is made again with the permissions that it had, where the
+// service may: what is reported from then on would be lost otherwise.
 //
 // A client may name a device, and of a device even the opening may do something. So what is named is only pointed at,
 // looked at, and opened as what was seen.
@@ -25,11 +26,7 @@ class FolderKeeper;
 class LinuxFileSystem final : public FileSystem {
 public:
     // Without a keeper, which outlives it, no folder is kept within limits.
-    explicit LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderKeeper* keeper = nullptr)
-        : diagnosticLogRoot_(std::move(diagnosticLogRoot)),
-          keeper_(keeper)
-    {
-    }
+    explicit LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderKeeper* keeper = nullptr);
 
     [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return diagnosticLogRoot_; }
     [[nodiscard]] std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
@@ -45,11 +42,14 @@ public:
     void removeUnfinished(const std::filesystem::path& folder);
 
 private:
+    // Makes the root again as it was in the beginning, and the folders above it that went with it.
+    [[nodiscard]] std::error_code makeRootAgain() const;
     // Steps down from the root, and makes the folders on the way that are missing, if there are permissions for them.
     [[nodiscard]] std::expected<FileDescriptor, std::error_code>
     openDirectory(const std::filesystem::path& path, std::optional<unsigned> permissionsOfMissing) const;
 
     const std::filesystem::path diagnosticLogRoot_;
+    const std::optional<unsigned> rootPermissions_; // in the beginning; nothing when there was none
     FolderKeeper* const keeper_;
 };
 

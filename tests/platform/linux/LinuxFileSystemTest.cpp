@@ -146,6 +146,42 @@ TEST_F(FileSystem, SaysWhyAFolderCannotBeMade)
     ASSERT_EQ(::chmod(root.c_str(), 0700), 0);
 }
 
+TEST_F(FileSystem, MakesItsRootAgainAsItWasWhenItWentMeanwhile)
+{
+    for (const fs::path& gone : {root / "state/logs", root / "state"})
+        for (const mode_t mask : {0U, 0777U}) {
+            fs::create_directories(root / "state/logs");
+            ASSERT_EQ(::chmod((root / "state/logs").c_str(), 02750), 0);
+            LinuxFileSystem logs(root / "state/logs");
+            fs::remove_all(gone);
+            EXPECT_EQ(logs.createAtomically(root / "state/logs/a.json").error(), std::errc::no_such_file_or_directory)
+                << "only folders that are asked for are made";
+            const mode_t before = ::umask(mask);
+            const auto made = logs.createDirectories(root / "state/logs/Audio", 0777);
+            ::umask(before);
+            ASSERT_TRUE(made) << made.error().message();
+            EXPECT_EQ(permissionsOf(root / "state/logs"), 02750U);
+            EXPECT_EQ(permissionsOf(root / "state/logs/Audio"), 0777U);
+            fs::remove_all(root / "state");
+        }
+}
+
+TEST_F(FileSystem, SaysWhyItsRootCannotBeMadeAgain)
+{
+    fs::create_directory(root / "logs");
+    LinuxFileSystem logs(root / "logs");
+    fs::remove(root / "logs");
+    ASSERT_EQ(::chmod(root.c_str(), 0555), 0);
+    EXPECT_TRUE(inChild([&] {
+        return becomeNobody()
+            && logs.createDirectories(root / "logs/Audio", 0777).error() == std::errc::permission_denied;
+    }));
+    ASSERT_EQ(::chmod(root.c_str(), 0700), 0);
+    fs::create_directory_symlink("nowhere", root / "logs");
+    EXPECT_FALSE(logs.createDirectories(root / "logs/Audio", 0777)) << "a link is the administrator's";
+    EXPECT_FALSE(fs::exists(root / "nowhere"));
+}
+
 TEST_F(FileSystem, KeepsBelowItsRoot)
 {
     const fs::path outside = root.parent_path() / "kesto-test-outside";
