@@ -271,7 +271,7 @@ public:
     // As of a value.
     [[nodiscard]] std::size_t roughBytes() const noexcept;
 
-    // Whether both are one object, which makes them equal at no cost.
+    // Whether both are one object. They are equal then but for what is no number, which equals nothing.
     [[nodiscard]] bool isSameObject(const Dictionary& other) const noexcept
     {
         return object_.get() == other.object_.get();
@@ -282,7 +282,7 @@ public:
     // The same keys with equal values, in any order.
     friend bool operator==(const Dictionary& left, const Dictionary& right) noexcept
     {
-        return left.isSameObject(right) || left.isEqualIgnoring(right, {});
+        return left.isEqualIgnoring(right, {});
     }
 
 private:

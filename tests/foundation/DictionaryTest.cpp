@@ -128,6 +128,13 @@ RC_GTEST_PROP(DictionaryProperty, FoldsRepeatedKeysAsAWalkWould, ())
         RC_ASSERT(*dictionary.find(entry.key) == entry.value);
 }
 
+TEST(Dictionary, DoesNotEqualItselfWhenItHoldsWhatIsNoNumber)
+{
+    const Dictionary dictionary{{"a", std::numeric_limits<double>::quiet_NaN()}};
+    EXPECT_NE(dictionary, dictionary);
+    EXPECT_NE(Value(dictionary), Value(dictionary));
+}
+
 RC_GTEST_PROP(DictionaryProperty, IsEqualInAnyOrder, ())
 {
     const Dictionary dictionary = *generated::entries(1);

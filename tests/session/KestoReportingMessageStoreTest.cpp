@@ -180,6 +180,32 @@ TEST(MessageStore, RecordsWhatIsNoNumberEachTimeSinceItEqualsNothing)
     EXPECT_EQ(store.record(4, 1, notANumber()), Outcome::Recorded);
 }
 
+// What is no number equals nothing, itself neither: wherever it stands, however large the rest is, and when it is the
+// very same object, as it is of a message that goes to one session twice.
+TEST(MessageStore, NeverTakesAPayloadThatHoldsWhatIsNoNumberForARepetition)
+{
+    const Value nan = std::numeric_limits<double>::quiet_NaN();
+    const std::string large(1500, 'x'); // too large to be kept decoded
+    for (const Dictionary& payload :
+         {Dictionary{{"a", nan}}, Dictionary{{"a", Value(std::numeric_limits<float>::quiet_NaN())}},
+          Dictionary{{"a", Dictionary{{"b", nan}}}}, Dictionary{{"a", Array{1, nan}}},
+          Dictionary{{"a", Array{Dictionary{{"b", nan}}}}}, Dictionary{{"a", nan}, {"b", large}},
+          Dictionary{{"a", Dictionary{{"b", nan}}}, {"b", large}}}) {
+        KestoReportingMessageStore store(plenty());
+        EXPECT_EQ(store.record(4, 1, payload), Outcome::Recorded);
+        EXPECT_EQ(store.record(4, 1, payload), Outcome::Recorded) << Value(payload).text();
+        EXPECT_EQ(store.record(4, 1, payload), Outcome::Recorded) << Value(payload).text();
+    }
+}
+
+TEST(MessageStore, LeavesATimeStampThatIsNoNumberOutOfTheComparison)
+{
+    KestoReportingMessageStore store(plenty());
+    const Dictionary payload{{"a", 1}, {"systemuptime_sec", std::numeric_limits<double>::quiet_NaN()}};
+    EXPECT_EQ(store.record(4, 1, payload), Outcome::Recorded);
+    EXPECT_EQ(store.record(4, 1, payload), Outcome::Redundant);
+}
+
 TEST(MessageStore, RecognisesARepetitionOfAPayloadTooLargeToBeKeptDecoded)
 {
     std::string huge(std::size_t{1} << 20, 'x');
