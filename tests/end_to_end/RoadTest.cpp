@@ -184,6 +184,33 @@ TEST_F(RoadTest, AClientThatDisconnectsLeavesAnUptimeEvent)
     EXPECT_FALSE(kestod.log().contains("interruptionHandler"));
 }
 
+TEST_F(RoadTest, AClientThatClosesItsSendingSideHasItsCallsCarriedOutAndGetsNoMoreAnswersThanHadLeft)
+{
+    constexpr std::uint64_t count = 200;
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    const auto start = client.call(Start, 1);
+    client.ask(GetAllReporters);
+    std::uint64_t next = 0;
+    for (std::uint64_t number = 0; number < count; ++number) {
+        const auto call = client.call(SendMessage, Dictionary{{"number", number}}, playback, typeStart, Array{1});
+        if (number == 0)
+            next = call;
+    }
+    client.closeSendingSide();
+    while (const auto reply = client.nextReply()) { // until the service closes its side, too
+        EXPECT_EQ(*reply, (Array{next, null}))
+            << "in their order, and never that to the start, which is call " << start;
+        ++next;
+    }
+    ASSERT_TRUE(kestod.waitForLog("removing " + std::to_string(::getpid()) + " from the server client list"));
+    static_cast<void>(
+        kestod.waitForEvents("com.quarn.kesto.kestoreportingclientuptime")); // which is stored after all others
+    EXPECT_THAT(kestod.events("com.quarn.kesto.Playback.Start"), SizeIs(count));
+    EXPECT_TRUE(kestod.log().contains("ending session 1"));
+    EXPECT_FALSE(kestod.log().contains("interruptionHandler"));
+}
+
 TEST_F(RoadTest, AResetIsAnInterruptionAndThenAnInvalidationAndStopsSessionsOnce)
 {
     WireClient client(kestod.socketPath());

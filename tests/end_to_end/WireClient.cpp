@@ -73,6 +73,11 @@ void WireClient::sendFrame(const foundation::Value& item, int times)
     sendBytes(frames);
 }
 
+void WireClient::closeSendingSide()
+{
+    ::shutdown(socket_.get(), SHUT_WR);
+}
+
 void WireClient::reset()
 {
     call(GetAllReporters); // an answer that nobody reads makes a close a reset

@@ -57,6 +57,8 @@ public:
     void sendFrame(const foundation::Value& item, int times = 1);
     void sendFrameBytes(std::string_view item);
     void sendBytes(std::string_view bytes);
+    // Sends nothing more, but goes on reading.
+    void closeSendingSide();
     // Ends the connection between frames.
     void close() { socket_ = platform::FileDescriptor(); }
     // Ends it so that the service is told of a reset.
