@@ -23,7 +23,8 @@ public:
     makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
                   std::string_view subtypeContext, std::string_view detectedProcess,
                   const std::optional<foundation::Value>& triggerThresholdValues);
-    // The reply comes later, on a queue of the service's choosing.
+    // The reply comes later, on a queue of the service's choosing: once, also when no snapshot is taken and when the
+    // reporter is gone. Its "success" says whether one was.
     virtual void requestSnapshot(foundation::Dictionary signature, double duration,
                                  const std::optional<foundation::Value>& event,
                                  const std::optional<foundation::Value>& payload, Reply reply) = 0;
@@ -35,8 +36,8 @@ public:
     virtual ~BugCapture() = default;
     [[nodiscard]] virtual std::unique_ptr<BugCaptureReporter> makeReporter() = 0;
 
-    // How whoever asks for snapshots is at that moment, to be kept in them: it is asked with each request, where and
-    // when that is made. To be set before the first; none unless it is.
+    // How whoever asks for snapshots is at that moment, to be kept in them: it is asked with each request that leads to
+    // one, where and when that is made. To be set before the first; none unless it is.
     using StateDescription = std::function<foundation::Value()>;
     virtual void setStateDescription(const StateDescription& /*describe*/) { }
 

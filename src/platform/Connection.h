@@ -3,7 +3,8 @@
 //
 // A connection knows nothing of the operations: a call is an array of values, checked by whoever is
 // given it. All handlers of one connection run on one connection thread, in order: calls, then at most
-// one interruption, then one invalidation, after which nothing follows.
+// one interruption, then one invalidation, after which nothing follows. What the peer sent before it went is
+// delivered before that; what it sent behind a call that breaks the protocol is not.
 #pragma once
 
 #include "foundation/Value.h"
@@ -35,7 +36,7 @@ public:
 
     virtual ~Connection() = default;
 
-    // The connection whose call the calling thread is handling, or null.
+    // The connection whose call the calling thread is handling, or null; null also in the handlers of its end.
     [[nodiscard]] static const Connection* current() noexcept { return current_; }
 
     // Makes a connection the current one of this thread while its calls are being handled.
@@ -56,7 +57,8 @@ public:
     [[nodiscard]] virtual std::string description() const = 0;
 
     // Before `resume`: what is called for each frame, when the connection broke, and when it is over (also
-    // after it broke, and when the peer closed it cleanly).
+    // after it broke, and when the peer closed it cleanly). All of them are held until the last has returned, and none
+    // after that.
     virtual void setCallHandler(CallHandler handler) = 0;
     virtual void setInterruptionHandler(EndHandler handler) = 0;
     virtual void setInvalidationHandler(EndHandler handler) = 0;
@@ -65,8 +67,8 @@ public:
     virtual void resume() = 0;
 
     // Queues one frame, an encoded CBOR item, to the peer. Never blocks; what is sent to a connection that
-    // is over is dropped. Frames sent on the server queue leave after the turn, once everything the turn
-    // stored is kept. Any thread.
+    // broke or is over, or is so before the frame could leave, is dropped. Frames sent on the server queue leave after
+    // the turn, once everything the turn stored is kept. Any thread.
     virtual void send(std::string frame) = 0;
 
 private:
@@ -79,7 +81,7 @@ class ConnectionListener;
 class ConnectionListenerDelegate {
 public:
     virtual ~ConnectionListenerDelegate() = default;
-    // True accepts; the delegate has then installed the handlers and resumed the connection.
+    // True accepts; the delegate has then installed the handlers and resumed the connection. False closes it.
     virtual bool shouldAcceptNewConnection(ConnectionListener& listener,
                                            const std::shared_ptr<Connection>& connection) = 0;
 };
@@ -89,7 +91,8 @@ class ConnectionListener {
 public:
     virtual ~ConnectionListener() = default;
     virtual void setDelegate(ConnectionListenerDelegate& delegate) = 0; // must outlive the listener's run
-    // Accepts connections; keeps the calling thread until `stop` (which only tests call).
+    // Accepts connections; keeps the calling thread until `stop` (which only tests call). The connections are
+    // invalidated before it returns.
     virtual void resume() = 0;
     virtual void stop() = 0;
 };

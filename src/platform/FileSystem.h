@@ -32,16 +32,19 @@ struct KeptFiles {
     bool (*isOne)(std::string_view name); // of a file name, whoever chose it. Any thread
 };
 
-// Any thread. What is written lies below the diagnostic-log root; other paths are errors.
+// Any thread. What is written lies below the diagnostic-log root; for other paths, `errc::invalid_argument` comes back.
 class FileSystem {
 public:
     virtual ~FileSystem() = default;
     // The folder below which diagnostic files are kept. It exists when the service starts.
     [[nodiscard]] virtual std::filesystem::path diagnosticLogRoot() const = 0;
     // Makes the folder and those above it that are missing, with exactly these permissions whatever the umask. Those
-    // that exist stay as they are. The root is made again, as it was, if it has gone.
+    // that exist stay as they are. The root is made again, as it was, if it has gone. `errc::not_a_directory` where a file
+    // stands.
     [[nodiscard]] virtual std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
                                                                                  unsigned permissions) = 0;
+    // Begins a file in a folder that exists. Several of one name may be in the making: the last that is committed
+    // counts.
     [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) = 0;
     // Tells that a file of that kind, of so many bytes, has come into the folder: if there are too many now, the oldest

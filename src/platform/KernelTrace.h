@@ -33,19 +33,24 @@ static_assert(sizeof(void*) != 8 || sizeof(KernelTraceEvent) == 96);
 
 // One trace session. Its handlers run on the queue that `start` was given, in the order of time.
 //
-// It may be destroyed by its own completion handler. Destroyed before it has ended, it is never completed; what is
-// on its way to the queue already may still be delivered.
+// It may be destroyed by its own completion handler. Destroyed before it is complete, it is never completed; what is
+// on its way to the queue already may still be delivered. Then its handlers are let go of.
 class KernelTraceSession {
 public:
     virtual ~KernelTraceSession() = default;
-    // Runs once, after the session ended and everything was delivered.
+    // Runs once, after the session ended and everything was delivered; not for one that was never given a queue. Before
+    // `start`.
     virtual void setCompletionHandler(std::function<void()> handler) = 0;
     // Whether events are to carry their wall-clock time. Before `start`; at first they do not.
     virtual void enableWallTimes(bool enabled) = 0;
-    // 0 or an error number, here and in `start`.
+    // 0 or an error number: for a range or a handler that is none, and after `start`. Both codes are in the range.
+    // Every handler whose range has the code gets the event.
     virtual int filterEventRange(std::uint32_t firstCode, std::uint32_t lastCode,
                                  std::function<void(const KernelTraceEvent&)> handler) = 0;
+    // 0 or an error number: without a queue, for a session that was started before, and where the system refuses. A
+    // session that the system refused is ended and completed like any other.
     virtual int start(std::shared_ptr<WorkQueue> queue) = 0;
+    // Once; more often does nothing.
     virtual void end() = 0;
     // How many events were lost while it ran, of which some or all may not have been its own: known once it is
     // complete, so ask in the completion handler.

@@ -73,11 +73,13 @@ struct LogRecord {
     std::string_view message; // without the prefix
 };
 
-// The platform's log. Its functions are called from any thread, several at once.
+// The platform's log. Its functions are called from any thread, several at once. Of the lines of one thread the order
+// is kept.
 class Log {
 public:
     virtual ~Log() = default;
     [[nodiscard]] virtual LogLevel threshold(const LogCategory& category) const = 0;
+    // Writes the line, whatever the threshold: that is for those who ask before.
     virtual void write(const LogRecord& record) = 0;
 };
 

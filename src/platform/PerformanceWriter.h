@@ -12,7 +12,7 @@ namespace platform {
 
 enum class PerformanceUnit : std::uint8_t { Nanoseconds };
 
-// An open file; destroying it flushes and closes.
+// An open file; destroying it flushes and closes. Until then the former file of its name stays in its place.
 class PerformanceFile {
 public:
     virtual ~PerformanceFile() = default;
@@ -25,7 +25,8 @@ public:
 class PerformanceWriter {
 public:
     virtual ~PerformanceWriter() = default;
-    // Null when the file cannot be opened.
+    // Null when the file cannot be opened: its folder is missing or not below the diagnostic-log root, or a folder
+    // stands in its place.
     [[nodiscard]] virtual std::unique_ptr<PerformanceFile> open(const std::filesystem::path& path,
                                                                 std::string_view project, std::uint32_t version) = 0;
 };

@@ -74,13 +74,18 @@ public:
     };
 
     virtual ~ReportingChannels() = default;
-    // An absent group or subgroup means any.
+    // An absent group or subgroup means any. Where nobody publishes, a set without channels or none comes back, and no
+    // error.
     virtual FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
                                               std::optional<std::string_view> subgroup) = 0;
+    // How many there were when the set was found.
     [[nodiscard]] virtual std::size_t channelCount(const ChannelSet& channels) const = 0;
     virtual Subscribed createSubscription(const ChannelSet& channels) = 0;
+    // The channels of the group and subgroup as they are at that moment, those too that came after the subscription.
     virtual std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
                                                                                 const ChannelSet& channels) = 0;
+    // What the counters of each channel of the later sample have gained; a channel that is new, or of which a counter
+    // began anew, counts whole. Extremes are the later ones, and a duty cycle is the share of the difference.
     virtual std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,
                                                                                    const ReportingSample& to) = 0;
 };

@@ -25,6 +25,7 @@ protected:
     ConnectionTest()
     {
         platform.processTable.add(pid, "player");
+        platform.analytics.use("com.quarn.*"); // as a device does unless its owner says otherwise
         platform.clock.set(startDate);
     }
 

@@ -48,8 +48,8 @@ protected:
     // Emits an interval of that length.
     void emit(std::uint64_t length)
     {
-        platform.kernelTrace.deliver({.timestamp = 1000, .threadID = 1, .eventCode = 0x21040010});
-        platform.kernelTrace.deliver({.timestamp = 1000 + length, .threadID = 1, .eventCode = 0x21040014});
+        platform.kernelTrace.deliver({.timestamp = now, .threadID = 1, .eventCode = 0x21040010});
+        platform.kernelTrace.deliver({.timestamp = now += length, .threadID = 1, .eventCode = 0x21040014});
     }
     [[nodiscard]] std::size_t tracesStarted() const { return platform.kernelTrace.sessions().size(); }
     [[nodiscard]] std::size_t filesWritten() const { return platform.performanceWriter.files().size(); }
@@ -68,6 +68,7 @@ protected:
         EXPECT_EQ(filesWritten(), 0U);
     }
 
+    std::uint64_t now = 1000; // by the kernel's time
     support::TestPlatform platform;
     std::shared_ptr<KestoReportingSession> session =
         std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});

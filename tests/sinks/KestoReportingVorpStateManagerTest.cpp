@@ -206,8 +206,7 @@ TEST_F(VorpStateManagerTest, AsksForASnapshotThatSaysWhatWasSeen)
                           {"type", "haptics"},
                           {"subType", "Playback"},
                           {"subtypeContext", "Gimbo"},
-                          {"detectedProcess", "player"},
-                          {"triggerThresholdValues", Value()}}));
+                          {"detectedProcess", "player"}}));
     EXPECT_EQ(snapshots()[0].duration, 0);
     EXPECT_EQ(snapshots()[0].event, std::nullopt);
     EXPECT_EQ(snapshots()[0].payload, std::nullopt);

@@ -1,6 +1,8 @@
 // Payloads are built when a test asks for them, never before: whether they are needed is for the test to say.
 #include "support/FakeAnalytics.h"
 
+#include "foundation/Json.h"
+
 #include <algorithm>
 #include <fnmatch.h>
 #include <ostream>
@@ -44,7 +46,8 @@ std::vector<AnalyticsEvent> FakeAnalytics::events()
             builder = nullptr;
             ++timesBuilt_;
         }
-        events.push_back({name, *payload});
+        if (std::string json; foundation::appendJson(*payload, json))
+            events.push_back({name, *payload});
     }
     return events;
 }
@@ -89,14 +92,21 @@ bool FakeAnalytics::isAnalyticsEventUsed(std::string_view eventName)
         observer_(name);
     const foundation::Lock lock(lock_);
     asked_.push_back(name);
+    return isUsed(name);
+}
+
+bool FakeAnalytics::isUsed(const std::string& name) const
+{
     return std::ranges::any_of(used_,
                                [&](const auto& pattern) { return fnmatch(pattern.c_str(), name.c_str(), 0) == 0; });
 }
 
 void FakeAnalytics::sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder)
 {
+    std::string name(eventName);
     const foundation::Lock lock(lock_);
-    sent_.push_back({std::string(eventName), std::move(payloadBuilder), std::nullopt});
+    if (isUsed(name))
+        sent_.push_back({std::move(name), std::move(payloadBuilder), std::nullopt});
 }
 
 } // namespace support

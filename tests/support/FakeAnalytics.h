@@ -1,5 +1,5 @@
 // An analytics service that keeps what it is sent. It is as lazy as a service may be: a payload is built when the
-// test looks at it, and never before.
+// test looks at it, and never before. What nobody wants is gone at once.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -29,10 +29,11 @@ public:
     // Is told each name when it is asked about.
     void setObserver(std::function<void(const std::string&)> observer) { observer_ = std::move(observer); }
 
-    // The names asked about, and those of the events sent, in order. Builds nothing.
+    // The names asked about, and those of the events sent that were wanted, in order. Builds nothing.
     [[nodiscard]] std::vector<std::string> asked() const;
     [[nodiscard]] std::vector<std::string> sent() const;
-    // The events sent, their payloads built now unless they were before; of one name in the second form.
+    // The events sent, their payloads built now unless they were before; of one name in the second form. Those whose
+    // payload JSON cannot say are lost.
     [[nodiscard]] std::vector<AnalyticsEvent> events();
     [[nodiscard]] std::vector<foundation::Dictionary> payloads(std::string_view name);
     // The builders of the events sent, in order, for who builds the payloads; the events are forgotten.
@@ -51,6 +52,8 @@ private:
         PayloadBuilder builder;
         std::optional<foundation::Dictionary> payload;
     };
+    [[nodiscard]] bool isUsed(const std::string& name) const KESTO_REQUIRES(lock_);
+
     std::function<void(const std::string&)> observer_;
     mutable foundation::Mutex lock_;
     std::vector<std::string> used_ KESTO_GUARDED_BY(lock_);

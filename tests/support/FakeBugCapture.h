@@ -17,6 +17,7 @@ public:
         std::optional<foundation::Value> payload;
         platform::BugCaptureReporter::Reply reply;
         std::int32_t sender = 0; // the current one when it was asked for
+        foundation::Value state; // of whoever asked, as it was then; null when it does not tell
     };
 
     // The snapshots asked for, in order; `snapshots()[0].reply(...)` answers one.
@@ -28,36 +29,25 @@ public:
     std::unique_ptr<platform::BugCaptureReporter> makeReporter() override
     {
         ++reportersMade_;
-        return std::make_unique<Reporter>(snapshots_);
+        return std::make_unique<Reporter>(*this);
     }
     void setStateDescription(const StateDescription& describe) override { describe_ = describe; }
 
 private:
     class Reporter final : public platform::BugCaptureReporter {
     public:
-        explicit Reporter(std::vector<Snapshot>& snapshots) : snapshots_(snapshots) { }
+        explicit Reporter(FakeBugCapture& capture) : capture_(capture) { }
 
-        foundation::Dictionary makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
-                                             std::string_view subtypeContext, std::string_view detectedProcess,
-                                             const std::optional<foundation::Value>& triggerThresholdValues) override
-        {
-            return {{"domain", domain},
-                    {"type", type},
-                    {"subType", subType},
-                    {"subtypeContext", subtypeContext},
-                    {"detectedProcess", detectedProcess},
-                    {"triggerThresholdValues", triggerThresholdValues.value_or(foundation::Value())}};
-        }
         void requestSnapshot(foundation::Dictionary signature, double duration,
                              const std::optional<foundation::Value>& event,
                              const std::optional<foundation::Value>& payload, Reply reply) override
         {
-            snapshots_.push_back(
-                {std::move(signature), duration, event, payload, std::move(reply), platform::BugCapture::currentSender()});
+            capture_.snapshots_.push_back({std::move(signature), duration, event, payload, std::move(reply),
+                                           platform::BugCapture::currentSender(), capture_.describeState()});
         }
 
     private:
-        std::vector<Snapshot>& snapshots_;
+        FakeBugCapture& capture_;
     };
 
     std::vector<Snapshot> snapshots_;

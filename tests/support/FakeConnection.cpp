@@ -1,7 +1,8 @@
 // The rules that a real connection keeps are expectations here: no call before reading begins, none after the end.
 #include "support/FakeConnection.h"
 
-#include <algorithm>
+#include "support/FakeWorkQueues.h"
+
 #include <gtest/gtest.h>
 #include <utility>
 
@@ -10,17 +11,60 @@ namespace support {
 using foundation::Array;
 using foundation::Value;
 
+// What a call holds until it is answered.
+class FakeConnection::Credit {
+public:
+    Credit(std::shared_ptr<FakeConnection> connection, std::size_t bytes)
+        : connection_(std::move(connection)),
+          bytes_(bytes)
+    {
+        ++connection_->unansweredCalls_;
+        connection_->unansweredBytes_ += bytes_;
+    }
+    ~Credit()
+    {
+        --connection_->unansweredCalls_;
+        connection_->unansweredBytes_ -= bytes_;
+    }
+    Credit(const Credit&) = delete;
+    Credit& operator=(const Credit&) = delete;
+
+private:
+    const std::shared_ptr<FakeConnection> connection_;
+    const std::size_t bytes_;
+};
+
 std::expected<void, platform::Connection::Violation> FakeConnection::call(Array frame)
 {
-    EXPECT_TRUE(isResumed_ && !isOver_) << "no call reaches a service that does not read";
-    std::string bytes;
-    foundation::appendCbor(Value(std::move(frame)), bytes);
-    const auto unanswered = std::make_shared<std::shared_ptr<Connection>>(shared_from_this());
-    unanswered_.push_back(unanswered);
+    EXPECT_TRUE(isResumed_ && !isInterrupted_ && !isOver_) << "no call reaches a service that does not read";
+    foundation::appendCbor(Value(std::move(frame)), unread_.emplace_back());
+    return readOn();
+}
+
+std::expected<void, platform::Connection::Violation> FakeConnection::readOn()
+{
+    while (!unread_.empty() && !isBehind())
+        if (auto delivered = deliverNext(); !delivered) {
+            breakOff();
+            return delivered;
+        }
+    return {};
+}
+
+bool FakeConnection::isBehind() const
+{
+    return unansweredCalls_ > mostUnansweredCalls || unansweredBytes_ > mostUnansweredBytes;
+}
+
+// Of those after a violation none is looked at.
+std::expected<void, platform::Connection::Violation> FakeConnection::deliverNext()
+{
+    const std::string bytes = std::move(unread_.front());
+    unread_.pop_front();
     const CallScope scope(*this);
-    auto result = callHandler_({decoded(bytes), {unanswered, this}});
+    auto result = callHandler_({decoded(bytes), {std::make_shared<Credit>(shared_from_this(), bytes.size()), this}});
     if (!result)
-        breakOff();
+        unread_.clear();
     return result;
 }
 
@@ -30,17 +74,21 @@ void FakeConnection::resume()
     isResumed_ = true;
 }
 
-std::size_t FakeConnection::unansweredCalls() const
+// What a peer has said before it went counts, however far behind it was.
+void FakeConnection::deliverWhatIsLeft()
 {
-    return static_cast<std::size_t>(
-        std::ranges::count_if(unanswered_, [](const auto& call) { return !call.expired(); }));
+    while (!isInterrupted_ && !unread_.empty())
+        if (!deliverNext())
+            interrupt();
 }
 
 void FakeConnection::close()
 {
+    deliverWhatIsLeft();
     if (std::exchange(isOver_, true))
         return;
-    invalidationHandler_();
+    if (invalidationHandler_)
+        invalidationHandler_();
     letGo(); // nothing follows, so nothing is held any more
 }
 
@@ -59,6 +107,7 @@ void FakeConnection::breakOff()
 
 void FakeConnection::interrupt()
 {
+    deliverWhatIsLeft();
     if (!isOver_ && !std::exchange(isInterrupted_, true))
         interruptionHandler_();
 }
@@ -70,8 +119,10 @@ std::string FakeConnection::description() const
 
 void FakeConnection::send(std::string frame)
 {
-    if (!isOver_)
-        received_.push_back(decoded(frame));
+    FakeWorkQueues::afterTurn([self = shared_from_this(), frame = std::move(frame)] {
+        if (!self->isInterrupted_ && !self->isOver_)
+            self->received_.push_back(self->decoded(frame));
+    });
 }
 
 Array FakeConnection::decoded(const std::string& frame)
@@ -83,17 +134,32 @@ Array FakeConnection::decoded(const std::string& frame)
 
 FakeConnectionListener::~FakeConnectionListener()
 {
-    for (const auto& known : connections_)
-        if (const auto connection = known.lock())
-            connection->letGo();
+    for (const auto& connection : living())
+        connection->letGo();
 }
 
 std::shared_ptr<FakeConnection> FakeConnectionListener::connect(std::int32_t processIdentifier)
 {
     auto connection = std::make_shared<FakeConnection>(processIdentifier);
     connections_.push_back(connection);
-    EXPECT_TRUE(delegate_->shouldAcceptNewConnection(*this, connection)) << "connections are never refused";
+    if (!delegate_->shouldAcceptNewConnection(*this, connection))
+        connection->close();
     return connection;
+}
+
+void FakeConnectionListener::stop()
+{
+    for (const auto& connection : living())
+        connection->close();
+}
+
+std::vector<std::shared_ptr<FakeConnection>> FakeConnectionListener::living() const
+{
+    std::vector<std::shared_ptr<FakeConnection>> living;
+    for (const auto& known : connections_)
+        if (auto connection = known.lock())
+            living.push_back(std::move(connection));
+    return living;
 }
 
 } // namespace support

@@ -8,6 +8,7 @@
 #include "foundation/Cbor.h"
 #include "platform/Connection.h"
 
+#include <deque>
 #include <memory>
 #include <string>
 #include <vector>
@@ -17,14 +18,20 @@ namespace support {
 // One thread.
 class FakeConnection final : public platform::Connection, public std::enable_shared_from_this<FakeConnection> {
 public:
+    // Beyond either, no more is read from the peer.
+    static constexpr std::size_t mostUnansweredCalls = 32 * 1024;
+    static constexpr std::size_t mostUnansweredBytes = 1024 * 1024;
+
     explicit FakeConnection(std::int32_t processIdentifier) : processIdentifier_(processIdentifier) { }
 
-    // Delivers one call. After a violation the connection breaks.
+    // The peer makes one call. It is delivered at once unless too much is unanswered; then it is when it can be, with
+    // the next call or with `readOn`. After a violation the connection breaks.
     std::expected<void, Violation> call(foundation::Array frame);
+    std::expected<void, Violation> readOn();
     // The frames that came back.
     [[nodiscard]] const std::vector<foundation::Array>& received() const { return received_; }
     // Calls that nobody has finished working on.
-    [[nodiscard]] std::size_t unansweredCalls() const;
+    [[nodiscard]] std::size_t unansweredCalls() const { return unansweredCalls_; }
 
     // The peer closes the connection: it is invalidated.
     void close();
@@ -35,6 +42,7 @@ public:
     void letGo();
 
     [[nodiscard]] bool isResumed() const { return isResumed_; }
+    [[nodiscard]] bool isOver() const { return isOver_; }
 
     [[nodiscard]] std::int32_t processIdentifier() const override { return processIdentifier_; }
     [[nodiscard]] std::string description() const override;
@@ -46,7 +54,12 @@ public:
     void send(std::string frame) override;
 
 private:
+    class Credit;
+
     [[nodiscard]] foundation::Array decoded(const std::string& frame);
+    [[nodiscard]] bool isBehind() const;
+    [[nodiscard]] std::expected<void, Violation> deliverNext();
+    void deliverWhatIsLeft();
 
     const std::int32_t processIdentifier_;
     CallHandler callHandler_;
@@ -56,8 +69,10 @@ private:
     bool isInterrupted_ = false;
     bool isOver_ = false;
     foundation::CborDecoder decoder_;
+    std::deque<std::string> unread_; // calls
     std::vector<foundation::Array> received_;
-    std::vector<std::weak_ptr<void>> unanswered_;
+    std::size_t unansweredCalls_ = 0;
+    std::size_t unansweredBytes_ = 0;
 };
 
 // Hands connections to its delegate when the test has them come.
@@ -68,14 +83,17 @@ public:
     FakeConnectionListener(const FakeConnectionListener&) = delete;
     FakeConnectionListener& operator=(const FakeConnectionListener&) = delete;
 
-    // A process connects.
+    // A process connects. The connection is over if the delegate refuses it.
     std::shared_ptr<FakeConnection> connect(std::int32_t processIdentifier);
 
     void setDelegate(platform::ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
+    // Keeps no thread: it is the test that has connections come.
     void resume() override { }
-    void stop() override { }
+    void stop() override;
 
 private:
+    [[nodiscard]] std::vector<std::shared_ptr<FakeConnection>> living() const;
+
     platform::ConnectionListenerDelegate* delegate_ = nullptr;
     std::vector<std::weak_ptr<FakeConnection>> connections_;
 };

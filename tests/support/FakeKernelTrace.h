@@ -16,12 +16,13 @@ public:
         std::uint32_t lastCode;
         std::function<void(const platform::KernelTraceEvent&)> handler;
     };
-    // What became of one session; stays when the session itself is gone.
+    // What became of one session; stays when the session itself is gone, without its handlers.
     struct Session {
         bool wallTimes = false;
         bool started = false;
         bool ended = false;
         bool destroyed = false;
+        std::uint64_t lost = 0;
         std::vector<Filter> filters;
         std::function<void()> completion;
         std::shared_ptr<platform::WorkQueue> queue;
@@ -31,8 +32,6 @@ public:
     bool available = true;
     int filterError = 0;
     int startError = 0;
-    // What each session says that it has lost.
-    std::uint64_t lost = 0;
     // Whether sessions are completed once they have ended, started or not.
     bool completes = true;
     // What a unit of time is; a nanosecond, unless it is set.
@@ -41,15 +40,23 @@ public:
     // The sessions that were made, in order.
     [[nodiscard]] const std::vector<std::shared_ptr<Session>>& sessions() const { return sessions_; }
     // Delivers the event to every running session that filters for its code; with its wall-clock time to those that
-    // enabled it.
+    // enabled it. Events are delivered in the order of time.
     void deliver(platform::KernelTraceEvent event);
+    // So many events are lost to every running session.
+    void lose(std::uint64_t count);
 
     bool isAvailable() override { return available; }
     std::unique_ptr<platform::KernelTraceSession> createTraceSession() override;
 
 private:
     class Handle;
+    [[nodiscard]] static bool isRunning(const Session& session)
+    {
+        return session.started && !session.ended && !session.destroyed;
+    }
+
     std::vector<std::shared_ptr<Session>> sessions_;
+    std::uint64_t lastTimestamp_ = 0;
 };
 
 } // namespace support

@@ -1,13 +1,20 @@
-// Handlers run on the queue that they were registered with, as with the real ones.
+// Handlers run on the queue that they were registered with, as with the real ones, and no more often than they must.
 #include "support/FakeNotifications.h"
+
+#include <utility>
 
 namespace support {
 
 void FakeNotifications::post(std::string_view name)
 {
-    for (std::size_t place = 0; place < registered_.size(); ++place)
-        if (const auto& [registeredName, queue, handler] = registered_[place]; registeredName == name)
-            queue->submit([handler, token = static_cast<std::int32_t>(place + 1)] { handler(token); });
+    for (std::size_t place = 0; place < registered_.size(); ++place) {
+        const auto& [registeredName, queue, handler, isToRun] = registered_[place];
+        if (registeredName == name && !std::exchange(*isToRun, true))
+            queue->submit([handler, isToRun, token = static_cast<std::int32_t>(place + 1)] {
+                *isToRun = false;
+                handler(token);
+            });
+    }
 }
 
 std::vector<std::string> FakeNotifications::registered() const
@@ -24,7 +31,7 @@ FakeNotifications::registerNotification(std::string_view name, std::shared_ptr<p
 {
     if (const auto failure = failures_.find(name); failure != failures_.end())
         return {.status = failure->second, .token = 0};
-    registered_.push_back({std::string(name), std::move(queue), std::move(handler)});
+    registered_.push_back({.name = std::string(name), .queue = std::move(queue), .handler = std::move(handler)});
     return {.status = 0, .token = static_cast<std::int32_t>(registered_.size())};
 }
 

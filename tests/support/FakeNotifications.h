@@ -17,7 +17,7 @@ public:
     // Gives the name a state that can be read.
     void setState(std::string name, std::uint64_t state) { states_.insert_or_assign(std::move(name), state); }
     void removeState(const std::string& name) { states_.erase(name); }
-    // Submits the handlers of the name to their queues.
+    // Submits the handlers of the name to their queues, but for those that are still to run because of an earlier post.
     void post(std::string_view name);
     // Makes registrations of the name fail with that status.
     void failRegistration(std::string name, platform::NotificationStatus status)
@@ -39,6 +39,7 @@ private:
         std::string name;
         std::shared_ptr<platform::WorkQueue> queue;
         Handler handler;
+        std::shared_ptr<bool> isToRun = std::make_shared<bool>(false);
     };
     std::vector<Registered> registered_;
     mutable std::vector<std::int32_t> asked_;

@@ -1,6 +1,8 @@
 // A sample is a copy of what is published at that moment; a difference is what the platform would make of two.
 #include "support/FakeReportingChannels.h"
 
+#include "platform/linux/ChannelDifference.h"
+
 #include <algorithm>
 #include <tuple>
 
@@ -9,13 +11,14 @@ namespace support {
 using platform::ReportingChannel;
 using platform::ReportingSample;
 
-// A channel set is the question that found it.
+// A channel set is the question that found it, and how many were found.
 struct FakeReportingChannels::Selection final : ChannelSet {
     Selection(Name givenGroup, Name givenSubgroup)
         : group(std::move(givenGroup)),
           subgroup(std::move(givenSubgroup)) { }
     Name group;
     Name subgroup;
+    std::size_t count = 0;
 };
 
 namespace {
@@ -26,21 +29,6 @@ bool isSameChannel(const ReportingChannel& left, const ReportingChannel& right)
         return std::tie(channel.driver, channel.group, channel.subgroup, channel.name);
     };
     return identity(left) == identity(right);
-}
-
-void subtract(ReportingChannel& channel, const ReportingChannel& earlier)
-{
-    channel.value -= earlier.value;
-    for (std::size_t place = 0; place < std::min(channel.buckets.size(), earlier.buckets.size()); ++place)
-        channel.buckets[place].hits -= earlier.buckets[place].hits;
-    double residency = 0;
-    for (std::size_t place = 0; place < std::min(channel.states.size(), earlier.states.size()); ++place) {
-        channel.states[place].transitions -= earlier.states[place].transitions;
-        channel.states[place].residency -= earlier.states[place].residency;
-        residency += static_cast<double>(channel.states[place].residency);
-    }
-    for (auto& state : channel.states)
-        state.dutyCycle = residency == 0 ? 0 : static_cast<double>(state.residency) / residency;
 }
 
 } // namespace
@@ -55,12 +43,17 @@ void FakeReportingChannels::publish(ReportingChannel channel)
         *found = std::move(channel);
 }
 
-std::vector<ReportingChannel> FakeReportingChannels::select(const ChannelSet& channels) const
+void FakeReportingChannels::withdraw(const ReportingChannel& channel)
 {
-    const auto& [group, subgroup] = dynamic_cast<const Selection&>(channels);
+    std::erase_if(channels_, [&](const auto& other) { return isSameChannel(other, channel); });
+}
+
+std::vector<ReportingChannel> FakeReportingChannels::select(const Selection& selection) const
+{
     std::vector<ReportingChannel> selected;
     for (const auto& channel : channels_)
-        if ((!group || channel.group == group) && (!subgroup || channel.subgroup == subgroup))
+        if ((!selection.group || channel.group == selection.group)
+            && (!selection.subgroup || channel.subgroup == selection.subgroup))
             selected.push_back(channel);
     return selected;
 }
@@ -71,6 +64,7 @@ FakeReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group
 {
     const auto selection = std::make_shared<Selection>(Name(group), Name(subgroup));
     const Failures& failing = failures(selection->group, selection->subgroup);
+    selection->count = select(*selection).size();
     asked_.emplace_back(selection->group, selection->subgroup);
     if (failing.copiesNothing || (failing.copy && !failing.copiesAnyway))
         return {.channels = nullptr, .error = failing.copy};
@@ -79,7 +73,7 @@ FakeReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group
 
 std::size_t FakeReportingChannels::channelCount(const ChannelSet& channels) const
 {
-    return select(channels).size();
+    return dynamic_cast<const Selection&>(channels).count;
 }
 
 platform::ReportingChannels::Subscribed FakeReportingChannels::createSubscription(const ChannelSet& channels)
@@ -98,7 +92,7 @@ FakeReportingChannels::createSamples(const Subscription&, const ChannelSet& chan
     const auto& selection = dynamic_cast<const Selection&>(channels);
     if (const auto error = failures(selection.group, selection.subgroup).sample)
         return std::unexpected(*error);
-    return ReportingSample{select(channels)};
+    return ReportingSample{select(selection)};
 }
 
 std::expected<ReportingSample, platform::ReportingChannelError>
@@ -106,12 +100,7 @@ FakeReportingChannels::createDifference(const ReportingSample& from, const Repor
 {
     if (differenceError_)
         return std::unexpected(*differenceError_);
-    ReportingSample difference = to;
-    for (auto& channel : difference.channels)
-        for (const auto& earlier : from.channels)
-            if (isSameChannel(channel, earlier))
-                subtract(channel, earlier);
-    return difference;
+    return platform::channelDifference(from, to);
 }
 
 } // namespace support

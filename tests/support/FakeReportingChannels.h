@@ -29,6 +29,7 @@ public:
 
     // Puts the channel in place of the one of the same driver, group, subgroup and name, or adds it.
     void publish(platform::ReportingChannel channel);
+    void withdraw(const platform::ReportingChannel& channel);
     void withdrawAll() { channels_.clear(); }
     Failures& failures(Name group, Name subgroup) { return failures_[{std::move(group), std::move(subgroup)}]; }
     void failDifferences(std::optional<Error> error) { differenceError_ = error; }
@@ -43,13 +44,12 @@ public:
     Subscribed createSubscription(const ChannelSet& channels) override;
     std::expected<platform::ReportingSample, Error> createSamples(const Subscription& subscription,
                                                                   const ChannelSet& channels) override;
-    // Values, hits, transitions and residencies subtracted; the duty cycle is the share of the difference.
     std::expected<platform::ReportingSample, Error> createDifference(const platform::ReportingSample& from,
                                                                      const platform::ReportingSample& to) override;
 
 private:
     struct Selection;
-    [[nodiscard]] std::vector<platform::ReportingChannel> select(const ChannelSet& channels) const;
+    [[nodiscard]] std::vector<platform::ReportingChannel> select(const Selection& selection) const;
 
     std::vector<platform::ReportingChannel> channels_;
     std::map<std::pair<Name, Name>, Failures> failures_;

@@ -69,17 +69,16 @@ private:
 class FakeProcessTable final : public platform::ProcessTable {
 public:
     static constexpr std::int32_t ownPID = 900;
+    static constexpr const char* ownName = "kestod";
 
-    void add(std::int32_t processIdentifier, std::string commandName)
-    {
-        names_.insert_or_assign(processIdentifier, std::move(commandName));
-    }
+    // A process that calls itself so; the kernel has room for 15 bytes of that.
+    void add(std::int32_t processIdentifier, std::string name);
     void remove(std::int32_t processIdentifier) { names_.erase(processIdentifier); }
     // The processes whose names were not to be believed any more, in order.
     [[nodiscard]] const std::vector<std::int32_t>& forgotten() const { return forgotten_; }
 
     [[nodiscard]] std::int32_t ownProcessIdentifier() const override { return ownPID; }
-    [[nodiscard]] std::string ownProcessName() const override { return "kestod"; }
+    [[nodiscard]] std::string ownProcessName() const override { return ownName; }
     [[nodiscard]] std::optional<platform::ProcessTableEntry> entry(std::int32_t processIdentifier) const override
     {
         const auto found = names_.find(processIdentifier);
@@ -90,7 +89,7 @@ public:
     void forget(std::int32_t processIdentifier) override { forgotten_.push_back(processIdentifier); }
 
 private:
-    std::map<std::int32_t, std::string> names_;
+    std::map<std::int32_t, std::string> names_{{ownPID, ownName}};
     std::vector<std::int32_t> forgotten_;
 };
 

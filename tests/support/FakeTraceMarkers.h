@@ -11,32 +11,55 @@
 
 namespace support {
 
+struct TraceMarkerEvent {
+    std::uint32_t code = 0;
+    std::array<std::uint64_t, 4> arguments{};
+    friend bool operator==(const TraceMarkerEvent&, const TraceMarkerEvent&) = default;
+};
+
 // Any thread.
 class FakeTraceMarkers final : public platform::TraceMarkers {
 public:
     // Is told each code as it comes.
     void setObserver(std::function<void(std::uint32_t)> observer) { observer_ = std::move(observer); }
-
-    // The codes since the last time.
-    std::vector<std::uint32_t> take()
+    // Whether somebody traces, as somebody does at first.
+    void setTraced(bool isTraced)
     {
         const foundation::Lock lock(lock_);
-        return std::exchange(codes_, {});
+        isTraced_ = isTraced;
+    }
+
+    // The codes since the last time, of the service's markers.
+    std::vector<std::uint32_t> take()
+    {
+        std::vector<std::uint32_t> codes;
+        for (const TraceMarkerEvent& event : takeEvents()) {
+            EXPECT_EQ(event.arguments, (std::array<std::uint64_t, 4>{})) << "the service's markers carry no arguments";
+            codes.push_back(event.code);
+        }
+        return codes;
+    }
+    // The same, of anybody's.
+    std::vector<TraceMarkerEvent> takeEvents()
+    {
+        const foundation::Lock lock(lock_);
+        return std::exchange(events_, {});
     }
 
     void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) override
     {
-        EXPECT_EQ(arguments, (std::array<std::uint64_t, 4>{})) << "the service's markers carry no arguments";
         if (observer_)
             observer_(code);
         const foundation::Lock lock(lock_);
-        codes_.push_back(code);
+        if (isTraced_)
+            events_.push_back({code, arguments});
     }
 
 private:
     std::function<void(std::uint32_t)> observer_;
     foundation::Mutex lock_;
-    std::vector<std::uint32_t> codes_ KESTO_GUARDED_BY(lock_);
+    bool isTraced_ KESTO_GUARDED_BY(lock_) = true;
+    std::vector<TraceMarkerEvent> events_ KESTO_GUARDED_BY(lock_);
 };
 
 } // namespace support

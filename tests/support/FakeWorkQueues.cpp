@@ -1,4 +1,5 @@
-// Items wait until a test runs them, in the order of all queues together; a serial queue never runs two at once.
+// Items wait until a test runs them, in the order of all queues together; a serial queue never runs two at once, and
+// the background queue no more than the few that its threads could.
 #include "support/FakeWorkQueues.h"
 
 #include <algorithm>
@@ -8,9 +9,23 @@
 
 namespace support {
 
+namespace {
+
+constexpr std::ptrdiff_t mostBackgroundThreads = 4;
+
+// What waits for the end of the turn that this thread runs; null while it runs none.
+thread_local std::vector<platform::WorkItem>* afterThisTurn = nullptr;
+
+} // namespace
+
 class FakeWorkQueues::Queue final : public platform::WorkQueue, public std::enable_shared_from_this<Queue> {
 public:
-    Queue(FakeWorkQueues& queues, bool isSerial) : queues_(queues), isSerial_(isSerial) { }
+    Queue(FakeWorkQueues& queues, std::ptrdiff_t mostAtOnce, bool hasTurns)
+        : queues_(queues),
+          mostAtOnce_(mostAtOnce),
+          hasTurns_(hasTurns)
+    {
+    }
 
     void submit(platform::WorkItem item) override { queues_.items_.push_back({shared_from_this(), std::move(item)}); }
 
@@ -19,14 +34,35 @@ public:
         return !queues_.running_.empty() && queues_.running_.back() == this;
     }
 
-    [[nodiscard]] bool mayRun() const
-    {
-        return !isSerial_ || std::ranges::find(queues_.running_, this) == queues_.running_.end();
-    }
+    [[nodiscard]] bool mayRun() const { return std::ranges::count(queues_.running_, this) < mostAtOnce_; }
+    [[nodiscard]] bool hasTurns() const { return hasTurns_; }
 
 private:
     FakeWorkQueues& queues_;
-    const bool isSerial_;
+    const std::ptrdiff_t mostAtOnce_;
+    const bool hasTurns_;
+};
+
+// While it lives, an item of the queue runs, and inside of it perhaps others.
+class FakeWorkQueues::Run {
+public:
+    Run(FakeWorkQueues& queues, Queue& queue, std::vector<platform::WorkItem>& whenOver)
+        : queues_(queues),
+          outerTurn_(std::exchange(afterThisTurn, queue.hasTurns() ? &whenOver : nullptr))
+    {
+        queues_.running_.push_back(&queue);
+    }
+    ~Run()
+    {
+        queues_.running_.pop_back();
+        afterThisTurn = outerTurn_;
+    }
+    Run(const Run&) = delete;
+    Run& operator=(const Run&) = delete;
+
+private:
+    FakeWorkQueues& queues_;
+    std::vector<platform::WorkItem>* const outerTurn_;
 };
 
 namespace {
@@ -51,7 +87,11 @@ private:
 
 } // namespace
 
-FakeWorkQueues::FakeWorkQueues(FakeClock& clock) : clock_(clock), background_(std::make_shared<Queue>(*this, false)) { }
+FakeWorkQueues::FakeWorkQueues(FakeClock& clock)
+    : clock_(clock),
+      background_(std::make_shared<Queue>(*this, mostBackgroundThreads, false))
+{
+}
 
 FakeWorkQueues::~FakeWorkQueues() = default;
 
@@ -67,11 +107,23 @@ bool FakeWorkQueues::runOne()
         return false;
     Item item = std::move(*next);
     items_.erase(next);
-    running_.push_back(item.queue.get());
-    item.work();
-    item.work = nullptr; // what it holds is let go of on its queue
-    running_.pop_back();
+    std::vector<platform::WorkItem> whenOver;
+    {
+        const Run run(*this, *item.queue, whenOver);
+        item.work();
+        item.work = nullptr; // what it holds is let go of on its queue
+    }
+    for (platform::WorkItem& each : whenOver)
+        each();
     return true;
+}
+
+void FakeWorkQueues::afterTurn(platform::WorkItem item)
+{
+    if (afterThisTurn != nullptr)
+        afterThisTurn->push_back(std::move(item));
+    else
+        item();
 }
 
 void FakeWorkQueues::advance(std::chrono::nanoseconds duration)
@@ -114,7 +166,7 @@ std::shared_ptr<platform::WorkQueue> FakeWorkQueues::makeSerialQueue(std::string
     if (!hasThreads)
         throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again));
     made_.push_back({std::string(name), quality});
-    return std::make_shared<Queue>(*this, true);
+    return std::make_shared<Queue>(*this, 1, quality == platform::QualityOfService::UserInteractive);
 }
 
 platform::WorkQueue& FakeWorkQueues::backgroundQueue()
@@ -124,7 +176,7 @@ platform::WorkQueue& FakeWorkQueues::backgroundQueue()
 
 void FakeWorkQueues::submitAfter(std::chrono::nanoseconds delay, platform::WorkQueue& queue, platform::WorkItem item)
 {
-    const auto due = now_ + delay;
+    const auto due = now_ + std::min(delay, std::chrono::nanoseconds::max() - now_);
     const auto place = std::ranges::upper_bound(delayed_, due, {}, &DelayedItem::due);
     delayed_.insert(place, {due, &queue, std::move(item)});
 }

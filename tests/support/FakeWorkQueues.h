@@ -2,7 +2,7 @@
 // which it was submitted, and delayed work when virtual time reaches it.
 //
 // What a real serial queue promises holds here too: while one of its items waits for a semaphore, other queues
-// go on and this one does not.
+// go on and this one does not. Each item of an interactive queue is a turn.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -41,6 +41,9 @@ public:
     // Drops what has not run.
     void discardAll();
 
+    // Runs the item when the turn that the calling thread runs is over, or here and now where it runs none.
+    static void afterTurn(platform::WorkItem item);
+
     // How many items wait to be run.
     [[nodiscard]] std::size_t pending() const { return items_.size(); }
     // The queues of the items that wait for their time, in the order of time.
@@ -58,6 +61,7 @@ public:
 
 private:
     class Queue;
+    class Run;
     struct Item {
         std::shared_ptr<Queue> queue;
         platform::WorkItem work;

@@ -43,17 +43,6 @@ TEST_F(FakeWorkQueuesTest, ItemsRunInTheOrderOfSubmissionAndThoseTheySubmitAfter
     EXPECT_THAT(noted, ElementsAre("a", "b", "c"));
 }
 
-TEST_F(FakeWorkQueuesTest, AQueueIsCurrentOnlyWhileItRunsAnItem)
-{
-    EXPECT_FALSE(serial->isCurrent());
-    serial->submit([this] {
-        EXPECT_TRUE(serial->isCurrent());
-        EXPECT_FALSE(other->isCurrent());
-    });
-    queues.runAll();
-    EXPECT_FALSE(serial->isCurrent());
-}
-
 TEST_F(FakeWorkQueuesTest, DelayedItemsRunAtTheirTimeInTheOrderOfTime)
 {
     const double start = clock.secondsSince1970();
@@ -68,20 +57,36 @@ TEST_F(FakeWorkQueuesTest, DelayedItemsRunAtTheirTimeInTheOrderOfTime)
     EXPECT_DOUBLE_EQ(clock.secondsSince1970(), start + 4.999);
 }
 
-TEST_F(FakeWorkQueuesTest, AWaitingSerialQueueLetsOthersWorkAndNotItself)
+TEST_F(FakeWorkQueuesTest, ABackgroundItemThatWaitsForMoreOthersThanThereAreThreadsWaitsForEver)
 {
     const auto semaphore = queues.makeSemaphore(0);
-    serial->submit([&] {
-        semaphore->wait();
-        noted.push_back("waited");
+    for (int item = 0; item < 3; ++item)
+        queues.backgroundQueue().submit([&] { semaphore->wait(); });
+    queues.backgroundQueue().submit([&] {
+        for (int item = 0; item < 3; ++item)
+            semaphore->signal();
     });
-    serial->submit(noting("after"));
-    other->submit([&] {
-        noted.push_back("signalled");
-        semaphore->signal();
-    });
+    queues.runAll(); // the fourth runs beside three
+    for (int item = 0; item < 4; ++item)
+        queues.backgroundQueue().submit([&] { semaphore->wait(); });
+    queues.backgroundQueue().submit([&] { semaphore->signal(); });
+    EXPECT_THROW(queues.runAll(), std::logic_error) << "the fifth does not run beside four";
+}
+
+TEST_F(FakeWorkQueuesTest, EachItemOfAnInteractiveQueueIsATurnAndNoOtherIs)
+{
+    const auto sending = [this](std::string what) {
+        return [this, what = std::move(what)] {
+            support::FakeWorkQueues::afterTurn(noting("after " + what));
+            noted.push_back(what);
+        };
+    };
+    serial->submit(sending("turn"));
+    serial->submit(noting("next"));
+    other->submit(sending("other"));
     queues.runAll();
-    EXPECT_THAT(noted, ElementsAre("signalled", "waited", "after"));
+    sending("here")();
+    EXPECT_THAT(noted, ElementsAre("turn", "after turn", "next", "after other", "other", "after here", "here"));
 }
 
 TEST_F(FakeWorkQueuesTest, AWaitThatWouldNeverEndIsAnError)

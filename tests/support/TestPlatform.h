@@ -37,8 +37,8 @@ public:
     FakeReportingChannels reportingChannels;
     FakeBugCapture bugCapture;
     FakeKernelTrace kernelTrace;
-    FakePerformanceWriter performanceWriter;
-    FakeFileSystem fileSystem;
+    FakeFileSystem fileSystem{&workQueues};
+    FakePerformanceWriter performanceWriter{fileSystem};
 };
 
 } // namespace support

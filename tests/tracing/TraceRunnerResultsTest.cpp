@@ -37,7 +37,8 @@ TEST_F(RunnerResults, GoToAFileInADirectoryThatEverybodyMayWriteTo)
 {
     trace({5});
     EXPECT_EQ(KestoReportingTracingLogsDirectory(), "/diagnostics/Audio/Traces");
-    EXPECT_THAT(platform.fileSystem.directories, ElementsAre(Pair("/diagnostics/Audio/Traces", 0777U)));
+    EXPECT_THAT(platform.fileSystem.directories,
+                ElementsAre(Pair("/diagnostics/Audio", 0777U), Pair("/diagnostics/Audio/Traces", 0777U)));
     ASSERT_THAT(platform.performanceWriter.files(), SizeIs(1));
     EXPECT_EQ(file().path, "/diagnostics/Audio/Traces/tracing_results.qdj");
     EXPECT_EQ(file().project, "KestoReporting");
@@ -72,11 +73,11 @@ TEST_F(RunnerResults, SayThatNothingIsMissing)
 
 TEST_F(RunnerResults, SayHowManyEventsTheTracesLost)
 {
-    platform.kernelTrace.lost = 1000;
     add(interval("one", "first"));
     add(interval("two", "second"));
     runner->runTraces();
     emit(5);
+    platform.kernelTrace.lose(1000);
     runner->stopTracingandProcessResults();
     EXPECT_EQ(file().remarks, (Remarks{{"lostEvents", 2000}, {"lostIntervals", 0}, {"lostPoints", 0}}));
 }
@@ -184,6 +185,7 @@ TEST_F(RunnerResults, MakeAFileWithoutRecordsWhenNothingWasMeasured)
 
 TEST_F(RunnerResults, AreWrittenAllTheSameWhenTheDirectoryCannotBeMade)
 {
+    platform.fileSystem.directories = {{"/diagnostics/Audio/Traces", 0777}}; // which is there, all the same
     platform.fileSystem.directoryError = std::make_error_code(std::errc::permission_denied);
     trace({5});
     EXPECT_THAT(platform.log.lines(),
@@ -222,7 +224,6 @@ TEST_F(RunnerResultsDeathTest, EndTheProcessAtOnceWithoutWhatIsLeftForItsExit)
 
 TEST_F(RunnerResultsDeathTest, EndTheProcessWithStatusOneAfterSayingThatTheDirectoryCannotBeMade)
 {
-    platform.performanceWriter.canOpen = false;
     platform.fileSystem.directoryError = std::make_error_code(std::errc::read_only_file_system);
     EXPECT_EXIT(traceAloud(), testing::ExitedWithCode(1),
                 "error kert can't create logging directory at /diagnostics/Audio/Traces: Read-only file system\n"

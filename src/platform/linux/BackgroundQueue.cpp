@@ -4,6 +4,7 @@
 
 #include "platform/linux/Thread.h"
 
+#include <system_error>
 #include <utility>
 
 namespace platform {
@@ -24,16 +25,27 @@ BackgroundQueue::~BackgroundQueue()
     }
     for (std::thread& thread : threads)
         thread.join();
+    run(); // what there never was a thread for
+    queueOfThisThread = nullptr;
 }
 
 void BackgroundQueue::submit(WorkItem item)
 {
     const foundation::Lock lock(lock_);
     waiting_.push_back(std::move(item));
-    if (freeThreads_ < waiting_.size() && threads_.size() < mostThreads && !isEnding_)
-        threads_.push_back(startThread("background", QualityOfService::Background, [this] { run(); }));
-    else
+    const bool isThreadWanted = freeThreads_ < waiting_.size() && threads_.size() < mostThreads && !isEnding_;
+    if (!isThreadWanted || !addThread())
         changed_.notifyOne();
+}
+
+bool BackgroundQueue::addThread()
+{
+    try {
+        threads_.push_back(startThread("background", QualityOfService::Background, [this] { run(); }));
+        return true;
+    } catch (const std::system_error&) {
+        return false;
+    }
 }
 
 bool BackgroundQueue::isCurrent() const

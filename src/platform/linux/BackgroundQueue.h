@@ -2,7 +2,9 @@
 // other is free.
 //
 // They are few on purpose, as background work must never crowd out the rest. An item that waits for
-// another item of the queue may therefore wait for ever.
+// another item of the queue may therefore wait for ever. When the system has no thread to spare, items wait for those
+// that there are, or for one that it has when the next item comes: who submits is in the middle of something else, and
+// could do nothing about it.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -29,6 +31,7 @@ public:
     [[nodiscard]] bool isCurrent() const override;
 
 private:
+    [[nodiscard]] bool addThread() KESTO_REQUIRES(lock_);
     void run();
     [[nodiscard]] WorkItem take();
 

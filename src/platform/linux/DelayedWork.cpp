@@ -3,6 +3,7 @@
 
 #include "platform/linux/Thread.h"
 
+#include <system_error>
 #include <utility>
 
 namespace platform {
@@ -25,9 +26,17 @@ void DelayedWork::add(Clock::time_point due, WorkQueue& queue, WorkItem item)
     const foundation::Lock lock(lock_);
     const auto added = schedule_.emplace(due, Delayed{queue, std::move(item)});
     if (!thread_.joinable())
-        thread_ = startThread("delayed work", QualityOfService::Default, [this] { run(); });
+        start();
     else if (added == schedule_.begin())
         changed_.notifyOne();
+}
+
+void DelayedWork::start()
+{
+    try {
+        thread_ = startThread("delayed work", QualityOfService::Default, [this] { run(); });
+    } catch (const std::system_error&) { // the next item tries again
+    }
 }
 
 void DelayedWork::run()

@@ -22,7 +22,8 @@ public:
     DelayedWork(const DelayedWork&) = delete;
     DelayedWork& operator=(const DelayedWork&) = delete;
 
-    // Submits the item to the queue, which still exists then, at that time or soon after.
+    // Submits the item to the queue, which still exists then, at that time or soon after; when the system has no thread
+    // to spare, not before it has one for an item that is added later.
     void add(Clock::time_point due, WorkQueue& queue, WorkItem item);
 
 private:
@@ -32,6 +33,7 @@ private:
     };
     using Schedule = std::multimap<Clock::time_point, Delayed>; // of equal times, the first added comes first
 
+    void start() KESTO_REQUIRES(lock_);
     void run();
     [[nodiscard]] Schedule::node_type waitForDue();
 

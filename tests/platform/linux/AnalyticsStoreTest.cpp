@@ -454,16 +454,6 @@ TEST_F(AnalyticsStoreTest, WhichEventsAreUsedMayChangeWhileTheServiceRuns)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(AnalyticsStoreTest, AnEventThatIsNotUsedIsNeitherBuiltNorKept)
-{
-    store().sendAnalyticsEventLazy("org.example.other", []() -> Dictionary {
-        ADD_FAILURE() << "nobody needs the payload";
-        return {};
-    });
-    closeStore();
-    EXPECT_EQ(storedEvents(), 0);
-}
-
 TEST_F(AnalyticsStoreTest, ABrokenConfigurationLeavesTheLastInForce)
 {
     support::writeFile(temporary.path() / "analytics.toml", "used = [\"a.*\"]");

@@ -1,175 +1,23 @@
-// A listener on a private socket with a delegate that keeps what it is told, and clients that speak in bytes: they
-// can do everything that a hostile one could.
+// A listener on a private socket with a delegate that keeps what it is told.
 #pragma once
 
-#include "foundation/Cbor.h"
 #include "foundation/Mutex.h"
-#include "platform/linux/FileDescriptor.h"
-#include "platform/linux/FrameReader.h"
+#include "platform/linux/ConnectionClient.h"
 #include "platform/linux/LinuxConnectionListener.h"
 #include "platform/linux/LinuxWorkQueues.h"
+#include "support/Progress.h"
 #include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
 
 #include <chrono>
-#include <condition_variable>
 #include <functional>
 #include <gtest/gtest.h>
 #include <map>
-#include <mutex>
-#include <optional>
-#include <poll.h>
 #include <string>
-#include <sys/socket.h>
-#include <sys/un.h>
 #include <thread>
 #include <vector>
 
 namespace support {
-
-constexpr std::chrono::seconds longestWait{30}; // for what must happen; a test that waits so long fails
-
-// The encoding of a value as one frame, with its head.
-inline std::string framed(const foundation::Value& value)
-{
-    std::string item;
-    foundation::appendCbor(value, item);
-    std::string bytes;
-    platform::appendFrame(item, bytes);
-    return bytes;
-}
-
-// The call with that number, and text to make it as large as a test needs it.
-inline std::string callNumber(int number, std::size_t textLength = 0)
-{
-    return framed(foundation::Array{number, std::string(textLength, 'x')});
-}
-
-inline std::string answerTo(const foundation::Array& call, std::size_t textLength = 0)
-{
-    std::string frame;
-    foundation::appendCbor(foundation::Array{call[0], std::string(textLength, 'y')}, frame);
-    return frame;
-}
-
-class Client {
-public:
-    explicit Client(const std::filesystem::path& path) : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0))
-    {
-        sockaddr_un address = {};
-        address.sun_family = AF_UNIX;
-        path.string().copy(address.sun_path, sizeof address.sun_path - 1);
-        if (::connect(socket_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0)
-            throw std::system_error(errno, std::generic_category(), "connect");
-    }
-
-    // Blocks until the service has taken the bytes.
-    void write(std::string_view bytes)
-    {
-        while (!bytes.empty()) {
-            const ssize_t count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
-            if (count < 0)
-                throw std::system_error(errno, std::generic_category(), "send");
-            bytes.remove_prefix(static_cast<std::size_t>(count));
-        }
-    }
-
-    // Writes as much as the service takes without being waited for; how many bytes that were.
-    std::size_t writeWhatFits(std::string_view bytes)
-    {
-        const ssize_t count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
-        return count < 0 ? 0 : static_cast<std::size_t>(count);
-    }
-
-    // The first number of the next frame; nothing when the service closed or reset the connection.
-    std::optional<int> readNumber()
-    {
-        while (true) {
-            const auto frame = reader_.next();
-            if (!frame)
-                throw std::runtime_error("the service sent a frame that is too long");
-            if (*frame) {
-                const auto value = decoder_.decode(**frame);
-                return static_cast<int>((*value->array())[0].number()->int64Value());
-            }
-            if (!readMore())
-                return std::nullopt;
-        }
-    }
-
-    // The numbers of so many frames.
-    std::vector<int> readNumbers(std::size_t count)
-    {
-        std::vector<int> numbers;
-        while (numbers.size() < count) {
-            const auto number = readNumber();
-            if (!number)
-                break;
-            numbers.push_back(*number);
-        }
-        return numbers;
-    }
-
-    // Whether something is there to be read now.
-    bool hasSomethingToRead()
-    {
-        pollfd events = {socket_.get(), POLLIN, 0};
-        return ::poll(&events, 1, 0) == 1;
-    }
-
-    void waitForSomethingToRead()
-    {
-        pollfd events = {socket_.get(), POLLIN, 0};
-        ASSERT_EQ(::poll(&events, 1, static_cast<int>(std::chrono::milliseconds(longestWait).count())), 1);
-    }
-
-    void close() { socket_ = platform::FileDescriptor(); }
-    void stopWriting() { ::shutdown(socket_.get(), SHUT_WR); }
-    void stopReading() { ::shutdown(socket_.get(), SHUT_RD); }
-    [[nodiscard]] int descriptor() const { return socket_.get(); }
-
-private:
-    bool readMore()
-    {
-        waitForSomethingToRead();
-        const ssize_t count = ::recv(socket_.get(), buffer_.data(), buffer_.size(), MSG_DONTWAIT);
-        if (count <= 0)
-            return false;
-        reader_.feed({buffer_.data(), static_cast<std::size_t>(count)});
-        return true;
-    }
-
-    platform::FileDescriptor socket_;
-    platform::FrameReader reader_;
-    foundation::CborDecoder decoder_;
-    std::vector<char> buffer_ = std::vector<char>(256 * 1024);
-};
-
-// Something that threads tell each other: a state that is waited for. Any thread.
-class Progress {
-public:
-    // Changes what the predicates look at.
-    template <typename Change> void change(Change change)
-    {
-        const std::scoped_lock lock(mutex_);
-        change();
-        changed_.notify_all();
-    }
-    template <typename Predicate> [[nodiscard]] bool waitFor(Predicate predicate)
-    {
-        std::unique_lock lock(mutex_);
-        return changed_.wait_for(lock, longestWait, predicate);
-    }
-    template <typename Look> auto look(Look look)
-    {
-        const std::scoped_lock lock(mutex_);
-        return look();
-    }
-
-private:
-    std::mutex mutex_;
-    std::condition_variable changed_;
-};
 
 inline constinit platform::LogCategory connectionTestCategory{"com.quarn.kesto", "kerc"};
 
@@ -186,8 +34,6 @@ public:
     bool shouldAcceptNewConnection(platform::ConnectionListener&,
                                    const std::shared_ptr<platform::Connection>& connection) override
     {
-        if (!accepts)
-            return false;
         auto record = std::make_shared<ConnectionRecord>();
         record->connection = connection;
         connection->setCallHandler(
@@ -280,7 +126,6 @@ protected:
     const std::filesystem::path path = directory.path() / "socket";
     Progress progress;
     std::vector<std::shared_ptr<ConnectionRecord>> records;
-    bool accepts = true;
     Handler handler; // instead of keeping the call
     std::function<void()> beforeListening; // what is to be set on the listener
     std::unique_ptr<platform::LinuxConnectionListener> listener;

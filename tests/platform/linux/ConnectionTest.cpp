@@ -39,60 +39,12 @@ std::vector<int> numbersUpTo(int last)
 
 class Connections : public support::ConnectionTest { };
 
-TEST_F(Connections, TellWhoIsAtTheOtherEnd)
+TEST_F(Connections, NameTheProcessAndTheUserAtTheOtherEnd)
 {
     listen();
     Client client(path);
-    const auto& connection = *connected().connection;
-    EXPECT_EQ(connection.processIdentifier(), ::getpid());
-    EXPECT_EQ(connection.description(),
+    EXPECT_EQ(connected().connection->description(),
               "connection of process " + std::to_string(::getpid()) + " (user " + std::to_string(::getuid()) + ")");
-}
-
-TEST_F(Connections, DeliverCallsAsValuesAndCarryAnswersBack)
-{
-    const Array call{7, 6, foundation::Dictionary{{"volume", 0.5F}, {"on", true}}, 4, 1, Array{42}};
-    handler = [&](ConnectionRecord& record, Connection::Call& made) -> std::expected<void, Connection::Violation> {
-        EXPECT_EQ(made.frame, call);
-        record.connection->send(answerTo(made.frame));
-        return {};
-    };
-    listen();
-    Client client(path);
-    client.write(framed(call));
-    EXPECT_EQ(client.readNumber(), 7);
-}
-
-TEST_F(Connections, AreTheCurrentOneWhileTheirCallIsHandled)
-{
-    const Connection* current = nullptr;
-    handler = [&](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
-        current = Connection::current();
-        record.connection->send(answerTo(call.frame));
-        return {};
-    };
-    listen();
-    Client client(path);
-    client.write(callNumber(1));
-    EXPECT_EQ(client.readNumber(), 1);
-    stop();
-    EXPECT_EQ(current, records.at(0)->connection.get());
-    EXPECT_EQ(Connection::current(), nullptr);
-}
-
-TEST_F(Connections, DeliverTheCallsOfOneWriteInTheirOrder)
-{
-    listen();
-    Client client(path);
-    std::string calls;
-    for (const int number : numbersUpTo(500))
-        calls += callNumber(number);
-    client.write(calls);
-    ConnectionRecord& record = connected();
-    ASSERT_TRUE(waitForCalls(record, 500));
-    stop();
-    for (const int number : numbersUpTo(500))
-        EXPECT_EQ(record.history[static_cast<std::size_t>(number) - 1], "call " + std::to_string(number));
 }
 
 TEST_F(Connections, PutCallsTogetherThatArriveInPieces)
@@ -133,37 +85,6 @@ TEST_F(Connections, CallAllHandlersOnOneThread)
     std::set<std::thread::id> threads(first.threads.begin(), first.threads.end());
     threads.insert(second.threads.begin(), second.threads.end());
     EXPECT_EQ(threads.size(), 1U);
-}
-
-TEST_F(Connections, LetGoOfTheirHandlersWhenTheyAreOver)
-{
-    listen();
-    Client client(path);
-    ConnectionRecord& record = connected();
-    client.close();
-    ASSERT_TRUE(waitForHistory(record, {"invalidated"}));
-    stop();
-    EXPECT_EQ(records.at(0).use_count(), 1);
-}
-
-TEST_F(Connections, ThatTheDelegateRefusesAreClosed)
-{
-    accepts = false;
-    listen();
-    Client client(path);
-    EXPECT_EQ(client.readNumber(), std::nullopt);
-    EXPECT_THAT(logged(), IsEmpty());
-}
-
-TEST_F(Connections, EndWhenTheListenerStops)
-{
-    listen();
-    Client client(path);
-    ConnectionRecord& record = connected();
-    stop();
-    EXPECT_THAT(record.history, ElementsAre("invalidated"));
-    EXPECT_EQ(client.readNumber(), std::nullopt);
-    EXPECT_THAT(logged(), IsEmpty());
 }
 
 TEST_F(Connections, MayOutliveTheirListener)
@@ -261,41 +182,6 @@ TEST_F(Connections, ServeAThousandClientsAtOnce)
 // How connections end.
 
 class ConnectionEnds : public support::ConnectionTest { };
-
-// Its call handler alone holds an object, which the other two reach weakly, as the service has it with its clients.
-class ConnectionsOfAnObject : public support::ConnectionTest {
-public:
-    bool shouldAcceptNewConnection(ConnectionListener&, const std::shared_ptr<Connection>& connection) override
-    {
-        const auto object = std::make_shared<int>();
-        weakObject = object;
-        const auto note = [this](std::string event) {
-            event += weakObject.expired() ? " without it" : " with it";
-            progress.change([&] { history.push_back(std::move(event)); });
-        };
-        connection->setCallHandler([object](Connection::Call) { return std::expected<void, Connection::Violation>(); });
-        connection->setInterruptionHandler([note] { note("interrupted"); });
-        connection->setInvalidationHandler([note] { note("invalidated"); });
-        connection->resume();
-        return true;
-    }
-
-protected:
-    std::weak_ptr<int> weakObject;
-    std::vector<std::string> history;
-};
-
-TEST_F(ConnectionsOfAnObject, HoldItUntilTheirLastHandlerHasReturned)
-{
-    listen();
-    Client client(path);
-    client.write("\x05");
-    client.close();
-    EXPECT_TRUE(progress.waitFor([&] { return history.size() == 2; }));
-    EXPECT_THAT(history, ElementsAre("interrupted with it", "invalidated with it"));
-    stop();
-    EXPECT_TRUE(weakObject.expired());
-}
 
 TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerClosesBetweenFrames)
 {

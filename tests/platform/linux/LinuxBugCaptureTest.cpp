@@ -74,19 +74,6 @@ protected:
     std::vector<Dictionary> responses;
 };
 
-TEST_F(LinuxBugCaptureTest, ASignatureSaysWhatWasSeenAndWhere)
-{
-    LinuxBugCapture capture(state, sources(), ProviderLog(log));
-    const auto reporter = capture.makeReporter();
-    EXPECT_EQ(signature(*reporter),
-              (Dictionary{{"domain", "Sonalis"},
-                          {"type", "haptics"},
-                          {"subType", "Playback"},
-                          {"subtypeContext", "Gimbo"},
-                          {"detectedProcess", "player"}}));
-    EXPECT_EQ(*reporter->makeSignature("d", "t", "s", "c", "p", Value(3)).find("triggerThresholdValues"), Value(3));
-}
-
 TEST_F(LinuxBugCaptureTest, WhoAsksDoesNotWaitForTheDisk)
 {
     LinuxBugCapture capture(state, sources(), ProviderLog(log));

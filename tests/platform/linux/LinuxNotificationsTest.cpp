@@ -89,26 +89,6 @@ TEST_F(LinuxNotificationsTest, MakesItsDirectory)
     EXPECT_TRUE(fs::is_directory(directory_));
 }
 
-TEST_F(LinuxNotificationsTest, PostsANameWhenItsFileIsWritten)
-{
-    Posts posts;
-    const auto registration = registerName(ringer, posts);
-    ASSERT_EQ(registration.status, 0U);
-    write(ringer, "1\n");
-    ASSERT_TRUE(posts.waitForMoreThan(0));
-    EXPECT_EQ(posts.tokens().front(), registration.token);
-    EXPECT_EQ(notifications_.state(registration.token), 1U);
-}
-
-TEST_F(LinuxNotificationsTest, PostsOnceForOneWrite)
-{
-    Posts posts;
-    (void)registerName(ringer, posts);
-    write(ringer, "1");
-    settle();
-    EXPECT_EQ(posts.tokens().size(), 1U);
-}
-
 TEST_F(LinuxNotificationsTest, PostsANameWhoseFileIsReplacedOrWrittenWithTheSameState)
 {
     Posts posts;
@@ -172,20 +152,6 @@ TEST_F(LinuxNotificationsTest, DoesNotPostWhenAFileVanishes)
     fs::remove(directory_ / ringer);
     settle();
     EXPECT_EQ(posts.tokens().size(), before);
-}
-
-TEST_F(LinuxNotificationsTest, TellsNamesApartByTheirTokens)
-{
-    Posts posts;
-    Posts others;
-    const auto registration = registerName(ringer, posts);
-    const auto other = registerName("com.quarn.kesto.reporting", others);
-    EXPECT_NE(registration.token, other.token);
-    write("com.quarn.kesto.reporting", "0");
-    ASSERT_TRUE(others.waitForMoreThan(0));
-    settle();
-    EXPECT_EQ(others.tokens().front(), other.token);
-    EXPECT_TRUE(posts.tokens().empty());
 }
 
 TEST_F(LinuxNotificationsTest, HasNoStateWithoutAFileOrWithGarbageInIt)

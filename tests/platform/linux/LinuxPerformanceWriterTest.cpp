@@ -129,17 +129,6 @@ TEST_F(PerformanceWriter, LosesRecordsThatWouldMakeTheFileTooLargeAndSaysHowMany
                 ElementsAre(IsLine(Error, "kerl", path.string() + " has become too large; 2 records are lost")));
 }
 
-TEST_F(PerformanceWriter, LeavesTheFormerFileInItsPlaceUntilTheNewOneIsClosed)
-{
-    support::writeFile(path, "former");
-    auto file = open();
-    file->write("a", 1, PerformanceUnit::Nanoseconds);
-    EXPECT_EQ(readFile(path), "former");
-    file.reset();
-    EXPECT_THAT(readFile(path), StartsWith("{\"project\""));
-    EXPECT_EQ(namesInDirectory(), 1U) << "nothing else is left";
-}
-
 TEST_F(PerformanceWriter, PutsTheFileInThePlaceOfALinkAndLeavesAloneWhatItPointedTo)
 {
     const fs::path target = directory.path() / "target";
@@ -166,11 +155,6 @@ TEST_F(PerformanceWriter, OpensNoFileWhereADirectoryStandsAndSaysSo)
     EXPECT_EQ(open(), nullptr);
     EXPECT_THAT(log.lines(), ElementsAre(IsLine(Error, "kerl", path.string() + " is a directory: remove it")));
     EXPECT_EQ(namesInDirectory(), 1U);
-}
-
-TEST_F(PerformanceWriter, OpensNoFileOutsideOfTheDiagnosticLogRoot)
-{
-    EXPECT_EQ(writer.open(fs::temp_directory_path() / "results", "p", 1), nullptr);
 }
 
 TEST(PerformanceWriterOnAFullDisk, SaysThatTheResultsAreLost)

@@ -60,35 +60,6 @@ TEST_F(LinuxReportingChannelsTest, AreNoneOnADeviceWhereNobodyPublishes)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(LinuxReportingChannelsTest, AreFoundByGroupAndBySubgroup)
-{
-    publish("amp/Speaker/MCA/a", "simple\n1\n");
-    publish("amp/Speaker/-/b", "simple\n2\n");
-    publish("amp/-/MCA/c", "simple\n3\n");
-    const auto count = [&](Name group, Name subgroup) {
-        return channels.channelCount(*channels.copyChannelsInGroup(group, subgroup).channels);
-    };
-    EXPECT_EQ(count("Speaker", std::nullopt), 2U);
-    EXPECT_EQ(count(std::nullopt, "MCA"), 2U);
-    EXPECT_EQ(count("Speaker", "MCA"), 1U);
-    EXPECT_EQ(count("Rx", std::nullopt), 0U);
-}
-
-TEST_F(LinuxReportingChannelsTest, TellHowTheyChangedBetweenTwoSamples)
-{
-    publish("amp/Speaker/-/kept", "simple\n10\n");
-    publish("amp/Speaker/-/gone", "simple\n10\n");
-    publish("amp/Speaker/-/begun anew", "simple\n10\n");
-    const auto subscribed = subscribe("Speaker", std::nullopt);
-    const auto before = sample(subscribed);
-    publish("amp/Speaker/-/kept", "simple\n15\n");
-    fs::remove(root / "amp/Speaker/-/gone");
-    publish("amp/Speaker/-/begun anew", "simple\n4\n");
-    publish("amp/Speaker/-/new", "simple\n7\n");
-    const auto difference = channels.createDifference(before, sample(subscribed));
-    EXPECT_THAT(valuesOf(*difference), ElementsAre(Pair("begun anew", 4), Pair("kept", 5), Pair("new", 7)));
-}
-
 TEST_F(LinuxReportingChannelsTest, HoldThoseOfTheSoundCardsInTheirGroups)
 {
     fs::copy(fs::path(KESTO_RECORDED_SOUND) / "hda-laptop", sound,

@@ -214,15 +214,6 @@ TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
     EXPECT_EQ(next.session->lostEvents(), 0U) << "what others lost before";
 }
 
-TEST_F(TracefsKernelTraceTest, TellsNoTimeOfDayToWhoDoesNotWantIt)
-{
-    Listener listener(trace, false);
-    ASSERT_EQ(listener.start(), 0);
-    tree.put(0, TracePageBuilder(1000).event(now(), firstCode).page());
-    ASSERT_TRUE(listener.waitForEvents(1));
-    EXPECT_EQ(listener.events()[0].wallTime, KernelTraceWallTime());
-}
-
 TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherSomebodyTraces)
 {
     std::optional<TraceDescriptors> handedOut;
@@ -262,38 +253,6 @@ TEST_F(TracefsKernelTraceTest, CompletesASessionThatCouldNotBeStarted)
                                    "the kernel trace cannot be switched on: No such file or directory")));
     listener.end();
     EXPECT_TRUE(listener.waitForCompletion());
-}
-
-TEST_F(TracefsKernelTraceTest, SaysWhatASessionCannotDo)
-{
-    Listener listener(trace);
-    EXPECT_EQ(listener.session->filterEventRange(2, 1, [](const KernelTraceEvent&) { }), EINVAL);
-    EXPECT_EQ(listener.session->filterEventRange(1, 2, nullptr), EINVAL);
-    EXPECT_EQ(listener.session->start(nullptr), EINVAL);
-    ASSERT_EQ(listener.start(), 0);
-    EXPECT_EQ(listener.start(), EALREADY);
-    EXPECT_EQ(listener.session->filterEventRange(1, 2, [](const KernelTraceEvent&) { }), EBUSY);
-    listener.end();
-    listener.end();
-    EXPECT_TRUE(listener.waitForCompletion()) << "once";
-}
-
-TEST_F(TracefsKernelTraceTest, LetsACompletionHandlerDestroyItsSession)
-{
-    std::unique_ptr<KernelTraceSession> session = trace.createTraceSession();
-    ASSERT_NE(session, nullptr);
-    std::atomic<bool> isDone = false;
-    session->setCompletionHandler([&] {
-        session.reset();
-        isDone = true;
-        isDone.notify_all();
-    });
-    const auto queue = std::make_shared<SerialQueue>("trace", QualityOfService::Default, nullptr);
-    ASSERT_EQ(session->start(queue), 0);
-    session->end();
-    isDone.wait(false);
-    EXPECT_EQ(session, nullptr);
-    EXPECT_TRUE(waitUntilOff());
 }
 
 TEST_F(TracefsKernelTraceTest, RunsNoMoreSessionsThanItMay)

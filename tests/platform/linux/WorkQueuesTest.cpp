@@ -1,6 +1,7 @@
 // Real threads, which are made to meet at the moments that matter by letting them wait for each other, never for a
 // while.
 #include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/NoThreads.h"
 #include "platform/linux/SerialQueue.h"
 #include "platform/linux/Thread.h"
 #include "support/Threads.h"
@@ -76,37 +77,6 @@ TEST_F(WorkQueuesTest, SerialQueueRunsOneItemAtATimeInTheOrderOfEachSubmitter)
         EXPECT_EQ(ofOne.size(), static_cast<std::size_t>(items));
         EXPECT_TRUE(std::ranges::is_sorted(ofOne));
     }
-}
-
-TEST_F(WorkQueuesTest, SerialQueueIsCurrentInsideItsItemsOnly)
-{
-    const auto queue = makeQueue();
-    const auto other = makeQueue();
-    bool isCurrent = false;
-    bool isOtherCurrent = true;
-    queue->submit([&] {
-        isCurrent = queue->isCurrent();
-        isOtherCurrent = other->isCurrent();
-    });
-    drain(*queue);
-    EXPECT_TRUE(isCurrent);
-    EXPECT_FALSE(isOtherCurrent);
-    EXPECT_FALSE(queue->isCurrent());
-}
-
-TEST_F(WorkQueuesTest, WhatAnItemHoldsIsReleasedBeforeTheNextItemRuns)
-{
-    const auto queue = makeQueue();
-    const auto begin = queues.makeSemaphore(0);
-    auto held = std::make_shared<int>(1);
-    const std::weak_ptr<int> watched = held;
-    bool wasReleased = false;
-    queue->submit([&] { begin->wait(); });
-    queue->submit([held = std::move(held)] { EXPECT_EQ(*held, 1); });
-    queue->submit([&] { wasReleased = watched.expired(); });
-    begin->signal();
-    drain(*queue);
-    EXPECT_TRUE(wasReleased);
 }
 
 // The history of a queue with turns: numbers are items, 0 is the end of a turn.
@@ -376,23 +346,6 @@ TEST_F(WorkQueuesTest, AQueueThatGoesRunsWhatWasSubmittedBefore)
     EXPECT_EQ(ran, 1000);
 }
 
-TEST_F(WorkQueuesTest, AQueueMayBeDroppedByItsOwnItem)
-{
-    std::latch both(2);
-    auto queue = makeQueue();
-    WorkQueue& submitting = *queue;
-    const auto handedOver = queues.makeSemaphore(0);
-    submitting.submit([&, held = std::weak_ptr<WorkQueue>(queue)] {
-        handedOver->wait();
-        queue.reset();
-        EXPECT_TRUE(held.expired());
-        both.count_down();
-    });
-    submitting.submit([&] { both.count_down(); });
-    handedOver->signal();
-    both.wait();
-}
-
 TEST_F(WorkQueuesTest, QueuesOutliveTheirMaker)
 {
     auto maker = std::make_unique<LinuxWorkQueues>();
@@ -507,28 +460,19 @@ TEST_F(WorkQueuesTest, BackgroundItemsMaySubmitAndAllRunBeforeTheQueueGoes)
     EXPECT_EQ(ran, 1000);
 }
 
-TEST_F(WorkQueuesTest, DelayedItemsRunInTheOrderOfTheirTimesAndNotBefore)
+TEST_F(WorkQueuesTest, BackgroundItemsThatNoThreadCameForRunBeforeTheQueueGoes)
 {
-    using Clock = std::chrono::steady_clock;
-    const auto queue = makeQueue();
-    std::vector<int> ran;
-    std::latch done(5);
-    const Clock::time_point begin = Clock::now();
-    const auto later = [&](std::chrono::milliseconds delay, int item) {
-        queues.submitAfter(delay, *queue, [&, delay, item] {
-            EXPECT_GE(Clock::now() - begin, delay);
-            ran.push_back(item);
-            done.count_down();
+    const support::NoThreads none;
+    int ran = 0;
+    {
+        BackgroundQueue queue;
+        queue.submit([&] {
+            ++ran;
+            EXPECT_TRUE(queue.isCurrent());
+            queue.submit([&] { ++ran; });
         });
-    };
-    queues.submitAfter(24h, *queue, [] { ADD_FAILURE(); });
-    later(30ms, 4); // before the one that the thread waits for
-    later(20ms, 2);
-    later(20ms, 3);
-    later(60ms, 5);
-    later(0ms, 1);
-    done.wait();
-    EXPECT_EQ(ran, (std::vector<int>{1, 2, 3, 4, 5}));
+    }
+    EXPECT_EQ(ran, 2);
 }
 
 TEST_F(WorkQueuesTest, DelayedItemsFromManyThreadsAllRun)
@@ -559,20 +503,6 @@ TEST_F(WorkQueuesTest, WhatIsNotDueYetIsDroppedAndHoldsNothingUp)
         others.submitAfter(std::chrono::nanoseconds::max(), *queue, [] { ADD_FAILURE(); });
     }
     EXPECT_TRUE(watched.expired());
-}
-
-TEST_F(WorkQueuesTest, SemaphoreLetsThroughAsManyAsItCounts)
-{
-    const auto semaphore = queues.makeSemaphore(2);
-    semaphore->wait();
-    semaphore->wait();
-    std::atomic<bool> signalled = false;
-    std::jthread signaller([&] {
-        signalled = true;
-        semaphore->signal();
-    });
-    semaphore->wait();
-    EXPECT_TRUE(signalled);
 }
 
 TEST_F(WorkQueuesTest, SemaphoreWakesEveryoneItLetsThrough)

@@ -1,0 +1,196 @@
+// The contract of platform/Analytics.h: events whose names somebody wants are kept, in order, with payloads that are
+// built once; of the others nothing remains.
+#include "platform/contract/Contract.h"
+#include "platform/linux/AnalyticsStore.h"
+#include "platform/linux/LinuxClock.h"
+#include "platform/linux/StoreReader.h"
+#include "support/FakeAnalytics.h"
+#include "support/FakeLog.h"
+#include "support/ParseJson.h"
+#include "support/TemporaryDirectory.h"
+
+#include <atomic>
+#include <gmock/gmock.h>
+#include <limits>
+#include <set>
+
+namespace contract {
+namespace {
+
+using foundation::Array;
+using foundation::Dictionary;
+using foundation::Value;
+using support::AnalyticsEvent;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+class AnalyticsSubject {
+public:
+    virtual ~AnalyticsSubject() = default;
+    [[nodiscard]] virtual platform::Analytics& analytics() = 0;
+    // From now on some consumer wants events of such names, which are globs; nobody wants any at first. It takes effect
+    // a moment later.
+    virtual void use(const std::string& pattern) = 0;
+    // The events that were kept, in order; the service has ended then.
+    [[nodiscard]] virtual std::vector<AnalyticsEvent> events() = 0;
+};
+
+class FakeAnalyticsSubject final : public AnalyticsSubject {
+public:
+    [[nodiscard]] platform::Analytics& analytics() override { return analytics_; }
+    void use(const std::string& pattern) override { analytics_.use(pattern); }
+    [[nodiscard]] std::vector<AnalyticsEvent> events() override { return analytics_.events(); }
+
+private:
+    support::FakeAnalytics analytics_;
+};
+
+class LinuxAnalyticsSubject final : public AnalyticsSubject {
+public:
+    LinuxAnalyticsSubject() { configure(); }
+
+    [[nodiscard]] platform::Analytics& analytics() override
+    {
+        if (!store_)
+            store_.emplace(directory_.path(), watcher_, clock_, platform::ProviderLog(log_));
+        return *store_;
+    }
+    void use(const std::string& pattern) override
+    {
+        patterns_ += (patterns_.empty() ? "\"" : ", \"") + pattern + '"';
+        configure();
+    }
+    [[nodiscard]] std::vector<AnalyticsEvent> events() override
+    {
+        store_.reset(); // which keeps all of them
+        support::StoreReader reader(directory_ / platform::EventWriter::fileName);
+        const auto names = reader.texts("SELECT name FROM events ORDER BY rowid");
+        const auto payloads = reader.texts("SELECT payload FROM events ORDER BY rowid");
+        std::vector<AnalyticsEvent> events;
+        for (std::size_t index = 0; index < names.size(); ++index)
+            events.push_back({names[index], support::parseJson(payloads.at(index)).value().dictionary().value()});
+        return events;
+    }
+
+private:
+    void configure() { support::replaceFile(directory_ / "analytics.toml", "used = [" + patterns_ + "]\n"); }
+
+    const support::TemporaryDirectory directory_;
+    support::FakeLog log_;
+    std::string patterns_;
+    platform::LinuxClock clock_;
+    platform::ConfigurationWatcher watcher_{directory_.path(), platform::ProviderLog(log_)};
+    std::optional<platform::AnalyticsStore> store_;
+};
+
+class AnalyticsContract : public Suite<AnalyticsSubject> {
+protected:
+    // Returns when events of that name are wanted.
+    void want(const std::string& name)
+    {
+        subject->use(name);
+        ASSERT_TRUE(eventually([&] { return subject->analytics().isAnalyticsEventUsed(name); }));
+    }
+    void send(const std::string& name, Dictionary payload)
+    {
+        subject->analytics().sendAnalyticsEventLazy(name, [payload = std::move(payload)] { return payload; });
+    }
+};
+KESTO_CONTRACT(AnalyticsContract, (provider<AnalyticsSubject, FakeAnalyticsSubject>("Fake")),
+               (provider<AnalyticsSubject, LinuxAnalyticsSubject>("Linux")));
+
+TEST_P(AnalyticsContract, WantsEventsOfTheNamesThatSomebodyUses)
+{
+    EXPECT_FALSE(subject->analytics().isAnalyticsEventUsed("com.quarn.a"));
+    want("com.quarn.a");
+    EXPECT_FALSE(subject->analytics().isAnalyticsEventUsed("com.quarn.b"));
+    EXPECT_FALSE(subject->analytics().isAnalyticsEventUsed("com.quarn.a.more"));
+    EXPECT_FALSE(subject->analytics().isAnalyticsEventUsed(""));
+    subject->use("com.quarn.kesto.*");
+    EXPECT_TRUE(eventually([&] { return subject->analytics().isAnalyticsEventUsed("com.quarn.kesto.a.b"); }));
+    EXPECT_TRUE(subject->analytics().isAnalyticsEventUsed("com.quarn.a")) << "still";
+}
+
+TEST_P(AnalyticsContract, KeepsEventsInTheOrderInWhichTheyWereSent)
+{
+    want("com.quarn.a");
+    want("com.quarn.b");
+    const Dictionary payload{
+        {"text", "é"}, {"on", true}, {"list", Array{1, Dictionary{{"a", -0.5}}}}, {"none", Value()}};
+    send("com.quarn.a", payload);
+    send("com.quarn.b", {});
+    send("com.quarn.a", {{"n", 2}});
+    EXPECT_THAT(subject->events(),
+                ElementsAre(AnalyticsEvent{"com.quarn.a", payload}, AnalyticsEvent{"com.quarn.b", {}},
+                            AnalyticsEvent{"com.quarn.a", {{"n", 2}}}));
+}
+
+TEST_P(AnalyticsContract, BuildsAPayloadOnceAndLetsItsBuilderGo)
+{
+    want("com.quarn.a");
+    int built = 0;
+    auto held = std::make_shared<int>(7);
+    const std::weak_ptr<int> watched = held;
+    subject->analytics().sendAnalyticsEventLazy("com.quarn.a", [&built, held = std::move(held)] {
+        ++built;
+        return Dictionary{{"n", *held}};
+    });
+    EXPECT_LE(built, 1);
+    EXPECT_EQ(subject->events().size(), 1U);
+    EXPECT_EQ(subject->events().size(), 1U) << "however often it is looked at";
+    EXPECT_EQ(built, 1);
+    EXPECT_TRUE(watched.expired());
+}
+
+TEST_P(AnalyticsContract, DropsAnEventThatNobodyWantsWithItsBuilder)
+{
+    want("com.quarn.a");
+    auto held = std::make_shared<int>(7);
+    const std::weak_ptr<int> watched = held;
+    subject->analytics().sendAnalyticsEventLazy("com.quarn.b", [held = std::move(held)] {
+        ADD_FAILURE() << "nobody needs the payload";
+        return Dictionary{{"n", *held}};
+    });
+    EXPECT_TRUE(watched.expired());
+    subject->use("com.quarn.*");
+    ASSERT_TRUE(eventually([&] { return subject->analytics().isAnalyticsEventUsed("com.quarn.b"); }));
+    EXPECT_THAT(subject->events(), IsEmpty()) << "also when somebody wants such events later";
+}
+
+TEST_P(AnalyticsContract, LosesAnEventWhosePayloadHoldsANumberThatIsNotFinite)
+{
+    want("com.quarn.a");
+    send("com.quarn.a", {{"n", 1}});
+    send("com.quarn.a", {{"n", std::numeric_limits<double>::quiet_NaN()}});
+    send("com.quarn.a", {{"n", Array{std::numeric_limits<float>::infinity()}}});
+    send("com.quarn.a", {{"n", 2}});
+    EXPECT_THAT(subject->events(),
+                ElementsAre(AnalyticsEvent{"com.quarn.a", {{"n", 1}}}, AnalyticsEvent{"com.quarn.a", {{"n", 2}}}));
+}
+
+TEST_P(AnalyticsContract, TakesEventsFromManyThreadsEachInItsOrder)
+{
+    constexpr int threads = 4;
+    constexpr int each = 500;
+    want("com.quarn.a");
+    {
+        std::vector<std::jthread> senders;
+        for (int sender = 0; sender < threads; ++sender)
+            senders.emplace_back([&, sender] {
+                for (int number = 0; number < each; ++number) {
+                    EXPECT_TRUE(subject->analytics().isAnalyticsEventUsed("com.quarn.a"));
+                    send("com.quarn.a", {{"sender", sender}, {"number", number}});
+                }
+            });
+    }
+    std::vector<int> next(threads, 0);
+    for (const AnalyticsEvent& event : subject->events()) {
+        int& expected = next.at(static_cast<std::size_t>(event.payload.find("sender")->number()->int64Value()));
+        EXPECT_EQ(event.payload.find("number")->number()->int64Value(), expected);
+        ++expected;
+    }
+    EXPECT_EQ(next, std::vector<int>(threads, each));
+}
+
+} // namespace
+} // namespace contract

@@ -1,0 +1,56 @@
+// What the contracts have in common. A contract is a suite of tests that is written once, against an interface of
+// src/platform, and runs on the fake and on the provider of Linux: what either does not keep is a defect of that one,
+// or of the interface's words.
+//
+// A suite sees both as a subject, which knows how to make the service and how to bring about what comes from outside: a
+// peer that connects, a file that changes, an event of the kernel.
+#pragma once
+
+#include "support/Progress.h"
+
+#include <chrono>
+#include <gtest/gtest.h>
+#include <memory>
+#include <ostream>
+#include <string>
+#include <string_view>
+#include <thread>
+
+namespace contract {
+
+// One of those on which a suite runs.
+template <typename Subject> struct Provider {
+    std::string_view name;
+    std::unique_ptr<Subject> (*make)();
+
+    friend void PrintTo(const Provider& provider, std::ostream* out) { *out << provider.name; }
+};
+
+template <typename Subject, typename Made> [[nodiscard]] Provider<Subject> provider(std::string_view name)
+{
+    return {name, []() -> std::unique_ptr<Subject> { return std::make_unique<Made>(); }};
+}
+
+template <typename Subject> class Suite : public testing::TestWithParam<Provider<Subject>> {
+protected:
+    const std::unique_ptr<Subject> subject = this->GetParam().make();
+};
+
+// Until it holds, which another thread may have to bring about.
+template <typename Condition> [[nodiscard]] bool eventually(Condition condition)
+{
+    const auto deadline = std::chrono::steady_clock::now() + support::longestWait;
+    while (!condition()) {
+        if (std::chrono::steady_clock::now() > deadline)
+            return false;
+        std::this_thread::yield();
+    }
+    return true;
+}
+
+} // namespace contract
+
+// Has the suite run on these providers: KESTO_CONTRACT(ClockContract, provider<Clock, FakeClock>("Fake"), ...)
+#define KESTO_CONTRACT(suite, ...)                                      \
+    INSTANTIATE_TEST_SUITE_P(Both, suite, testing::Values(__VA_ARGS__), \
+                             [](const auto& instance) { return std::string(instance.param.name); })

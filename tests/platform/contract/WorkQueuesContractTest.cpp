@@ -1,0 +1,311 @@
+// The contract of platform/WorkQueue.h: the order of items, who runs them when, and what waits for what.
+#include "platform/contract/Contract.h"
+#include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/NoThreads.h"
+#include "support/FakeWorkQueues.h"
+
+#include <gmock/gmock.h>
+#include <optional>
+#include <string>
+#include <system_error>
+#include <vector>
+
+namespace contract {
+namespace {
+
+using namespace std::chrono_literals;
+using platform::QualityOfService;
+using platform::WorkQueue;
+using testing::ElementsAre;
+using Seconds = std::chrono::duration<double>;
+
+class WorkQueuesSubject {
+public:
+    virtual ~WorkQueuesSubject() = default;
+    [[nodiscard]] virtual platform::WorkQueues& queues() = 0;
+    // Runs what waits on the queues, if nobody else does.
+    virtual void work() { }
+    // Lets so much time pass, if it does not pass by itself.
+    virtual void letPass(std::chrono::nanoseconds) { }
+    [[nodiscard]] virtual Seconds now() const = 0;
+    // Whether the process gets another thread.
+    virtual void setThreads(bool areThere) = 0;
+};
+
+class FakeWorkQueuesSubject final : public WorkQueuesSubject {
+public:
+    [[nodiscard]] platform::WorkQueues& queues() override { return queues_; }
+    void work() override { queues_.runAll(); }
+    void letPass(std::chrono::nanoseconds duration) override { queues_.advance(duration); }
+    [[nodiscard]] Seconds now() const override { return Seconds(clock_.systemUptime()); }
+    void setThreads(bool areThere) override { queues_.hasThreads = areThere; }
+
+private:
+    support::FakeClock clock_;
+    support::FakeWorkQueues queues_{clock_};
+};
+
+class LinuxWorkQueuesSubject final : public WorkQueuesSubject {
+public:
+    [[nodiscard]] platform::WorkQueues& queues() override { return queues_; }
+    [[nodiscard]] Seconds now() const override { return std::chrono::steady_clock::now().time_since_epoch(); }
+    void setThreads(bool areThere) override
+    {
+        noThreads_.reset();
+        if (!areThere)
+            noThreads_.emplace();
+    }
+
+private:
+    std::optional<support::NoThreads> noThreads_;
+    platform::LinuxWorkQueues queues_;
+};
+
+class WorkQueuesContract : public Suite<WorkQueuesSubject> {
+protected:
+    std::shared_ptr<WorkQueue> makeQueue(QualityOfService quality = QualityOfService::Default)
+    {
+        return subject->queues().makeSerialQueue("com.quarn.kesto.test", quality);
+    }
+    void note(const std::string& what)
+    {
+        progress.change([&] { noted.push_back(what); });
+    }
+    auto noting(std::string what)
+    {
+        return [this, what = std::move(what)] { note(what); };
+    }
+    // What was noted, once there is so much of it.
+    std::vector<std::string> waitForNotes(std::size_t count)
+    {
+        subject->work();
+        EXPECT_TRUE(progress.waitFor([&] { return noted.size() >= count; }));
+        return progress.look([&] { return noted; });
+    }
+
+    support::Progress progress;
+    std::vector<std::string> noted;
+};
+KESTO_CONTRACT(WorkQueuesContract, (provider<WorkQueuesSubject, FakeWorkQueuesSubject>("Fake")),
+               (provider<WorkQueuesSubject, LinuxWorkQueuesSubject>("Linux")));
+
+// --- serial queues
+
+TEST_P(WorkQueuesContract, SerialQueuesRunOneItemAtATimeInTheOrderOfSubmission)
+{
+    for (const auto quality :
+         {QualityOfService::UserInteractive, QualityOfService::Default, QualityOfService::Background}) {
+        const auto queue = makeQueue(quality);
+        const std::size_t before = progress.look([&] { return noted.size(); });
+        std::vector<int> ran; // without a lock: one item at a time touches it
+        for (int item = 0; item < 1000; ++item)
+            queue->submit([&, item] { ran.push_back(item); });
+        queue->submit(noting("done"));
+        waitForNotes(before + 1);
+        ASSERT_EQ(ran.size(), 1000U);
+        EXPECT_TRUE(std::ranges::is_sorted(ran));
+    }
+}
+
+TEST_P(WorkQueuesContract, WhatAnItemSubmitsToItsQueueRunsBehindWhatWaitsThereAlready)
+{
+    const auto queue = makeQueue();
+    const auto begin = subject->queues().makeSemaphore(0);
+    queue->submit([&] { begin->wait(); });
+    queue->submit([&] {
+        note("a");
+        queue->submit(noting("c"));
+    });
+    queue->submit(noting("b"));
+    begin->signal();
+    EXPECT_THAT(waitForNotes(3), ElementsAre("a", "b", "c"));
+}
+
+TEST_P(WorkQueuesContract, AQueueIsCurrentWhileItRunsAnItemAndNowhereElse)
+{
+    const auto queue = makeQueue();
+    const auto other = makeQueue();
+    EXPECT_FALSE(queue->isCurrent());
+    queue->submit([&] {
+        note(queue->isCurrent() ? "current" : "not current");
+        note(other->isCurrent() || subject->queues().backgroundQueue().isCurrent() ? "another, too" : "no other");
+    });
+    EXPECT_THAT(waitForNotes(2), ElementsAre("current", "no other"));
+    EXPECT_FALSE(queue->isCurrent());
+}
+
+TEST_P(WorkQueuesContract, AnItemThatWaitsHoldsUpItsQueueAndNoOther)
+{
+    const auto queue = makeQueue();
+    const auto other = makeQueue();
+    const auto semaphore = subject->queues().makeSemaphore(0);
+    queue->submit([&] {
+        semaphore->wait();
+        note("waited");
+    });
+    queue->submit(noting("after"));
+    other->submit([&] {
+        note(queue->isCurrent() ? "on the queue that waits" : "on its own");
+        semaphore->signal();
+    });
+    EXPECT_THAT(waitForNotes(3), ElementsAre("on its own", "waited", "after"));
+}
+
+TEST_P(WorkQueuesContract, WhatAnItemHoldsIsLetGoOnItsQueueBeforeTheNextItemRuns)
+{
+    const auto queue = makeQueue();
+    std::shared_ptr<void> held(
+        nullptr, [this, &queue](void*) { note(queue->isCurrent() ? "let go on the queue" : "let go elsewhere"); });
+    queue->submit([this, held = std::move(held)] { note("ran"); });
+    queue->submit(noting("next"));
+    EXPECT_THAT(waitForNotes(3), ElementsAre("ran", "let go on the queue", "next"));
+}
+
+TEST_P(WorkQueuesContract, AQueueThatIsLetGoRunsWhatWasSubmittedBefore)
+{
+    auto queue = makeQueue();
+    for (const char* item : {"a", "b", "c"})
+        queue->submit(noting(item));
+    queue.reset();
+    EXPECT_THAT(waitForNotes(3), ElementsAre("a", "b", "c"));
+}
+
+TEST_P(WorkQueuesContract, AQueueMayBeLetGoByItsOwnItem)
+{
+    auto queue = makeQueue();
+    WorkQueue& submitting = *queue;
+    const auto begin = subject->queues().makeSemaphore(0);
+    submitting.submit([&] {
+        begin->wait();
+        queue.reset();
+        note("let go");
+    });
+    submitting.submit(noting("after"));
+    begin->signal();
+    EXPECT_THAT(waitForNotes(2), ElementsAre("let go", "after"));
+}
+
+// --- the background queue
+
+TEST_P(WorkQueuesContract, BackgroundItemsDoNotWaitForEachOther)
+{
+    WorkQueue& background = subject->queues().backgroundQueue();
+    const auto semaphore = subject->queues().makeSemaphore(0);
+    background.submit([&] {
+        semaphore->wait();
+        note(background.isCurrent() ? "waited in the background" : "waited elsewhere");
+    });
+    background.submit([&] {
+        note("signalled");
+        semaphore->signal();
+    });
+    EXPECT_THAT(waitForNotes(2), ElementsAre("signalled", "waited in the background"));
+    EXPECT_FALSE(background.isCurrent());
+}
+
+TEST_P(WorkQueuesContract, BackgroundItemsMaySubmitOthers)
+{
+    WorkQueue& background = subject->queues().backgroundQueue();
+    background.submit([&] {
+        note("a");
+        background.submit(noting("b"));
+    });
+    EXPECT_THAT(waitForNotes(2), ElementsAre("a", "b"));
+}
+
+// --- later
+
+TEST_P(WorkQueuesContract, DelayedItemsRunOnTheirQueueNotBeforeTheirTimeAndInItsOrder)
+{
+    const auto queue = makeQueue();
+    const Seconds begin = subject->now();
+    const auto later = [&](std::chrono::milliseconds delay, const std::string& item) {
+        subject->queues().submitAfter(delay, *queue, [&, delay, item] {
+            EXPECT_TRUE(queue->isCurrent());
+            EXPECT_GE(subject->now() - begin, Seconds(delay) - Seconds(1us)); // which a double may miss
+            note(item);
+        });
+    };
+    later(30ms, "d");
+    later(10ms, "b");
+    later(10ms, "c");
+    later(60ms, "e");
+    later(0ms, "a");
+    subject->letPass(60ms);
+    EXPECT_THAT(waitForNotes(5), ElementsAre("a", "b", "c", "d", "e"));
+}
+
+TEST_P(WorkQueuesContract, AnItemWhoseTimeHasPassedRunsSoon)
+{
+    const auto queue = makeQueue();
+    subject->queues().submitAfter(-1h, *queue, noting("ran"));
+    subject->letPass(0ms);
+    EXPECT_THAT(waitForNotes(1), ElementsAre("ran"));
+}
+
+TEST_P(WorkQueuesContract, AnItemThatIsDelayedForEverHoldsUpNothing)
+{
+    const auto queue = makeQueue();
+    subject->letPass(1s); // so that the longest delay leads beyond all times
+    subject->queues().submitAfter(std::chrono::nanoseconds::max(), *queue, [] { ADD_FAILURE(); });
+    subject->queues().submitAfter(1ms, *queue, noting("soon"));
+    subject->letPass(1ms);
+    EXPECT_THAT(waitForNotes(1), ElementsAre("soon"));
+}
+
+// --- semaphores
+
+TEST_P(WorkQueuesContract, ASemaphoreLetsAsManyPassAsItCounts)
+{
+    const auto semaphore = subject->queues().makeSemaphore(2);
+    semaphore->wait();
+    semaphore->wait();
+    semaphore->signal();
+    semaphore->signal();
+    semaphore->signal();
+    semaphore->wait();
+    semaphore->wait();
+    const auto queue = makeQueue();
+    queue->submit([&] {
+        semaphore->wait();
+        note("third");
+        semaphore->wait();
+        note("fourth");
+    });
+    const auto other = makeQueue();
+    other->submit([&] {
+        note("signalled");
+        semaphore->signal();
+    });
+    const auto notes = waitForNotes(3);
+    EXPECT_THAT(notes, testing::UnorderedElementsAre("third", "signalled", "fourth"));
+    EXPECT_EQ(notes.back(), "fourth");
+}
+
+// --- without threads
+
+TEST_P(WorkQueuesContract, MakingAQueueThrowsWhenThereIsNoThreadForItAndWorksAgainAfterwards)
+{
+    subject->setThreads(false);
+    EXPECT_THROW(makeQueue(), std::system_error);
+    subject->setThreads(true);
+    makeQueue()->submit(noting("ran"));
+    EXPECT_THAT(waitForNotes(1), ElementsAre("ran"));
+}
+
+TEST_P(WorkQueuesContract, WorkIsTakenAlsoWhenThereIsNoThreadForItAndRunsWithTheNext)
+{
+    WorkQueue& background = subject->queues().backgroundQueue();
+    const auto queue = makeQueue();
+    subject->setThreads(false);
+    EXPECT_NO_THROW(background.submit(noting("background")));
+    EXPECT_NO_THROW(subject->queues().submitAfter(0ms, *queue, noting("delayed")));
+    subject->setThreads(true);
+    background.submit(noting("next"));
+    subject->queues().submitAfter(0ms, *queue, noting("next delayed"));
+    subject->letPass(0ms);
+    EXPECT_THAT(waitForNotes(4), testing::UnorderedElementsAre("background", "next", "delayed", "next delayed"));
+}
+
+} // namespace
+} // namespace contract
