@@ -146,8 +146,10 @@ ChannelFolder::ChannelFolder(std::string root, ChannelPlace place, std::string t
 
 ChannelFolder::~ChannelFolder()
 {
+    const int error = errno; // which may be on its way to a caller that gave up
     claim_.reset();
     removeIfEmpty(root_, place_);
+    errno = error;
 }
 
 int ChannelFolder::open() noexcept

@@ -58,6 +58,7 @@ public:
     // Writes whatever may not be up to date in the files. KESTO_SYSTEM_ERROR, with `errno`, when a file cannot be.
     [[nodiscard]] kesto_status flush() noexcept;
     [[nodiscard]] kesto_publisher_statistics statistics() const noexcept;
+    [[nodiscard]] const std::string& root() const noexcept { return settings_.root; }
 
 private:
     struct Published {

@@ -136,6 +136,11 @@ void kesto_publisher_free(kesto_publisher* publisher)
         delete publisher;
 }
 
+const char* kesto_publisher_root(const kesto_publisher* publisher)
+{
+    return publisher == nullptr ? nullptr : publisher->root().c_str();
+}
+
 void kesto_publisher_get_statistics(const kesto_publisher* publisher, kesto_publisher_statistics* statistics,
                                     size_t size)
 {

@@ -76,6 +76,13 @@ TEST_F(PublisherTest, WritesNothingBeforeThereIsAChannel)
     EXPECT_FALSE(fs::exists(root));
 }
 
+TEST_F(PublisherTest, TellsWhereItsTreeIs)
+{
+    EXPECT_EQ(publisher.root(), root);
+    EXPECT_EQ(kesto::Publisher().root(), "");
+    EXPECT_EQ(kesto_publisher_root(nullptr), nullptr);
+}
+
 TEST_F(PublisherTest, ShowsAChannelAsSoonAsItIsCreated)
 {
     kesto::SimpleChannel channel;
@@ -271,6 +278,22 @@ TEST_F(PublisherTest, EntersNoFolderThatBelongsToSomebodyElse)
     EXPECT_EQ(channel.create(publisher, {"amp", "Tx", "", "a"}), Status::SystemError);
     EXPECT_EQ(errno, EPERM);
     EXPECT_THAT(namesIn(root + "/amp"), IsEmpty());
+}
+
+TEST_F(PublisherTest, TellsWhyItMayNotWriteAndNotWhatCameAfterThat)
+{
+    constexpr uid_t nobody = 65534;
+    if (::geteuid() != 0)
+        GTEST_SKIP() << "only root can become somebody else";
+    fs::create_directories(root + "/amp");
+    fs::permissions(directory.path(), fs::perms(0755));
+    kesto::SimpleChannel channel;
+    ASSERT_EQ(::seteuid(nobody), 0);
+    for (const char* driver : {"amp", "codec"}) {
+        EXPECT_EQ(channel.create(publisher, {driver, "Tx", "", "a"}), Status::SystemError);
+        EXPECT_EQ(errno, EACCES) << driver;
+    }
+    ASSERT_EQ(::seteuid(0), 0);
 }
 
 TEST_F(PublisherTest, SaysThatAFileCannotBeWrittenAndTriesAgain)

@@ -1,12 +1,14 @@
 // The table of the channels, and the arithmetic between what PipeWire tells and what they count.
 #include "kesto-pipewire/DeviceChannels.h"
 
+#include "kesto-pipewire/DriverName.h"
 #include "kesto-pipewire/Text.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
 #include <cmath>
+#include <filesystem>
 #include <string_view>
 #include <system_error>
 #include <utility>
@@ -15,8 +17,6 @@
 namespace kesto_pipewire {
 
 namespace {
-
-constexpr auto driver = "pipewire";
 
 // As `DeviceState` counts them.
 const std::vector<const char*> stateNames{"Suspended", "Idle", "Running", "Error"};
@@ -45,9 +45,11 @@ std::string essenceOf(std::string_view name)
     return essence;
 }
 
-// Right after it was returned.
+// Right after it was returned. Empty when all is well.
 std::string reasonOf(kesto::Status status)
 {
+    if (status == kesto::Status::Ok)
+        return {};
     return status == kesto::Status::SystemError ? std::generic_category().message(errno) : kesto::errorText(status);
 }
 
@@ -61,36 +63,106 @@ template <typename... Create> kesto::Status createAll(Create... create)
 
 } // namespace
 
-DeviceChannels::DeviceChannels(std::string root, const Diagnostics& diagnostics) : diagnostics_(diagnostics)
+DeviceChannels::DeviceChannels(std::string root, const Diagnostics& diagnostics)
+    : diagnostics_(diagnostics),
+      root_(std::move(root))
 {
-    kesto::PublisherOptions options;
-    options.root = std::move(root);
-    options.refreshInterval = std::chrono::milliseconds::max(); // `flush` tells how long states have lasted
-    auto status = publisher_.open(options);
-    if (status == kesto::Status::Ok)
-        status = createTotals();
-    if (status != kesto::Status::Ok)
-        diagnostics_.say("statistics of devices cannot be published: {}", reasonOf(status));
+    publish();
 }
 
-kesto::Status DeviceChannels::createTotals()
+void DeviceChannels::flush()
 {
-    return createAll([&] { return totals_[0].create(publisher_, Direction::Output, ""); },
-                     [&] { return totals_[1].create(publisher_, Direction::Input, ""); },
-                     [&] { return anyRuns_.create(publisher_, {driver, "Speaker", "", "any"}, {"Idle", "Running"}); },
+    publish();
+    publisher_.flush();
+}
+
+void DeviceChannels::publish()
+{
+    auto reason = totals_ ? std::string() : publishTotals();
+    for (auto& [serial, device] : devices_)
+        if (totals_ && !device.channels)
+            if (auto problem = publish(device); !problem.empty())
+                reason = std::move(problem);
+    auto problem = reason.empty() ? std::string() : describe(reason);
+    if (problem != problem_)
+        diagnostics_.say("statistics of devices {}", problem.empty() ? "are published in " + place() : problem);
+    problem_ = std::move(problem);
+}
+
+std::string DeviceChannels::place() const
+{
+    return (std::filesystem::path(publisher_.root()) / driver_).string();
+}
+
+std::string DeviceChannels::describe(const std::string& reason) const
+{
+    constexpr auto hope = "It is tried again with each session.";
+    if (!publisher_.isOpen())
+        return fmt::format("cannot be published: {}. {}", reason, hope);
+    return fmt::format("cannot be published in {}: {}. {} {}", place(), reason, adviceOn(publisher_.root(), driver_),
+                       hope);
+}
+
+std::string DeviceChannels::publishTotals()
+{
+    kesto::PublisherOptions options;
+    options.root = root_; // where none is given, its place depends on what is there, and so on when it is opened
+    options.refreshInterval = std::chrono::milliseconds::max(); // `flush` tells how long states have lasted
+    if (auto reason = reasonOf(publisher_.open(options)); !reason.empty())
+        return reason;
+    auto [name, whyNotTheUsual] = driverNameIn(publisher_.root());
+    driver_ = std::move(name);
+    if (auto reason = reasonOf(create(totals_.emplace())); !reason.empty()) {
+        totals_.reset();
+        return reason;
+    }
+    if (!whyNotTheUsual.empty())
+        diagnostics_.say("{}: statistics of devices are published in {} beside it", whyNotTheUsual, driver_);
+    countRunning();
+    return {};
+}
+
+std::string DeviceChannels::publish(Device& device)
+{
+    auto reason = reasonOf(create(device.channels.emplace(), device));
+    if (reason.empty())
+        device.channels->states.enter(static_cast<std::size_t>(device.state));
+    else
+        device.channels.reset();
+    return reason;
+}
+
+kesto::Status DeviceChannels::create(TotalChannels& totals)
+{
+    auto& [cycles, anyRuns, startTimes] = totals;
+    return createAll([&] { return create(cycles[0], Direction::Output, ""); },
+                     [&] { return create(cycles[1], Direction::Input, ""); },
+                     [&] { return anyRuns.create(publisher_, {driver_, "Speaker", "", "any"}, {"Idle", "Running"}); },
                      [&] {
-                         return startTimes_.create(publisher_, {driver, "StateTransitionTimes_ms", "", "to Running"},
-                                                   "ms", startBounds);
+                         return startTimes.create(publisher_, {driver_, "StateTransitionTimes_ms", "", "to Running"},
+                                                  "ms", startBounds);
                      });
 }
 
-kesto::Status DeviceChannels::CycleChannels::create(const kesto::Publisher& publisher, Direction direction,
-                                                    const std::string& subgroup)
+kesto::Status DeviceChannels::create(DeviceOwnChannels& channels, const Device& device)
+{
+    const auto& name = device.subgroup;
+    return createAll(
+        [&] { return create(channels.cycles, device.direction, name); },
+        [&] { return channels.states.create(publisher_, {driver_, "Speaker", name, "state"}, stateNames); },
+        [&] {
+            return channels.startTimes.create(publisher_, {driver_, "StateTransitionTimes_ms", name, "to Running"},
+                                              "ms", startBounds);
+        });
+}
+
+kesto::Status DeviceChannels::create(CycleChannels& channels, Direction direction, const std::string& subgroup)
 {
     const auto* group = cycleGroup(direction);
-    return createAll([&] { return cycles.create(publisher, {driver, group, subgroup, "cycles"}); },
-                     [&] { return lateCycles.create(publisher, {driver, group, subgroup, "late cycles"}); },
-                     [&] { return workTimes.create(publisher, {driver, group, subgroup, "work"}, "us", workBounds); });
+    return createAll(
+        [&] { return channels.cycles.create(publisher_, {driver_, group, subgroup, "cycles"}); },
+        [&] { return channels.lateCycles.create(publisher_, {driver_, group, subgroup, "late cycles"}); },
+        [&] { return channels.workTimes.create(publisher_, {driver_, group, subgroup, "work"}, "us", workBounds); });
 }
 
 // No subgroup would mean all devices together.
@@ -107,17 +179,6 @@ std::string DeviceChannels::freeSubgroup(const std::string& name) const
         if (std::ranges::none_of(devices_, isTaken))
             return subgroup;
     }
-}
-
-kesto::Status DeviceChannels::create(Device& device)
-{
-    const auto& name = device.subgroup;
-    return createAll([&] { return device.cycles.create(publisher_, device.direction, name); },
-                     [&] { return device.states.create(publisher_, {driver, "Speaker", name, "state"}, stateNames); },
-                     [&] {
-                         return device.startTimes.create(
-                             publisher_, {driver, "StateTransitionTimes_ms", name, "to Running"}, "ms", startBounds);
-                     });
 }
 
 void DeviceChannels::CycleChannels::count(const NodeCycle& cycle)
@@ -142,9 +203,8 @@ void DeviceChannels::deviceAppeared(DeviceSerial serial, const DeviceDescription
     Device device;
     device.direction = description.direction;
     device.subgroup = freeSubgroup(description.name);
-    if (const auto status = create(device); status != kesto::Status::Ok)
-        diagnostics_.detail("no statistics of {}: {}", description.name, reasonOf(status));
     devices_.emplace(serial, std::move(device));
+    publish();
 }
 
 void DeviceChannels::deviceStateChanged(DeviceSerial serial, DeviceState state, Moment when)
@@ -153,15 +213,17 @@ void DeviceChannels::deviceStateChanged(DeviceSerial serial, DeviceState state, 
     if (device == nullptr || device->state == state)
         return;
     device->state = state;
-    device->states.enter(static_cast<std::size_t>(state));
+    if (device->channels)
+        device->channels->states.enter(static_cast<std::size_t>(state));
     if (state == DeviceState::Running && device->wantedSince) {
         constexpr double millisecondsASecond = 1000;
         const auto wanted = std::exchange(device->wantedSince, std::nullopt);
         const auto milliseconds = std::llround((when.uptime - wanted->uptime) * millisecondsASecond);
-        if (milliseconds <= startBounds.back()) { // longer waits are those of somebody who has paused
-            device->startTimes.record(milliseconds);
-            startTimes_.record(milliseconds);
-        }
+        const bool isStart = milliseconds <= startBounds.back(); // longer waits are those of somebody who has paused
+        if (isStart && device->channels)
+            device->channels->startTimes.record(milliseconds);
+        if (isStart && totals_)
+            totals_->startTimes.record(milliseconds);
     }
     countRunning();
 }
@@ -182,8 +244,10 @@ void DeviceChannels::deviceCycle(DeviceSerial serial, const NodeCycle& cycle)
     auto* device = find(serial);
     if (device == nullptr)
         return;
-    device->cycles.count(cycle);
-    totals_[static_cast<std::size_t>(device->direction)].count(cycle);
+    if (device->channels)
+        device->channels->cycles.count(cycle);
+    if (totals_)
+        totals_->cycles[static_cast<std::size_t>(device->direction)].count(cycle);
 }
 
 void DeviceChannels::deviceGone(DeviceSerial serial)
@@ -194,9 +258,11 @@ void DeviceChannels::deviceGone(DeviceSerial serial)
 
 void DeviceChannels::countRunning()
 {
+    if (!totals_)
+        return;
     const bool anyRuns =
         std::ranges::any_of(devices_, [](const auto& each) { return each.second.state == DeviceState::Running; });
-    anyRuns_.enter(anyRuns ? 1 : 0);
+    totals_->anyRuns.enter(anyRuns ? 1 : 0);
 }
 
 } // namespace kesto_pipewire

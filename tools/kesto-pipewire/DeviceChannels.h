@@ -5,7 +5,8 @@
 // there is a channel when it starts. The others are a device's, in a subgroup of its name, and come and go with it.
 // Devices may share a name: the second one's subgroup is "name#2", and stays that though the first one goes.
 //
-// A device that cannot be published, for want of a folder or of room, is left aside: reporting goes on without it.
+// What cannot be published, for want of a folder or of room, is tried again with each session and each new device;
+// reporting goes on without it.
 #pragma once
 
 #include "kesto-pipewire/Device.h"
@@ -26,8 +27,8 @@ public:
     // `root` is the channel tree; empty means where libkesto looks by default.
     DeviceChannels(std::string root, const Diagnostics& diagnostics);
 
-    // Has the files show what is so now.
-    void flush() { publisher_.flush(); }
+    // Has the files show what is so now, and publishes what could not be published before.
+    void flush();
 
     void deviceAppeared(DeviceSerial serial, const DeviceDescription& description) override;
     void deviceStateChanged(DeviceSerial serial, DeviceState state, Moment when) override;
@@ -42,31 +43,48 @@ private:
         kesto::SimpleChannel lateCycles;
         kesto::HistogramChannel workTimes;
 
-        [[nodiscard]] kesto::Status create(const kesto::Publisher& publisher, Direction direction,
-                                           const std::string& subgroup);
         void count(const NodeCycle& cycle);
+    };
+    struct TotalChannels {
+        std::array<CycleChannels, 2> cycles; // by direction
+        kesto::StateChannel anyRuns;
+        kesto::HistogramChannel startTimes;
+    };
+    struct DeviceOwnChannels {
+        CycleChannels cycles;
+        kesto::StateChannel states;
+        kesto::HistogramChannel startTimes;
     };
     struct Device {
         Direction direction = Direction::Output;
         std::string subgroup;
         DeviceState state = DeviceState::Suspended;
         std::optional<Moment> wantedSince; // while it is wanted and has not run since
-        CycleChannels cycles;
-        kesto::StateChannel states;
-        kesto::HistogramChannel startTimes;
+        std::optional<DeviceOwnChannels> channels; // while it is published
     };
 
-    [[nodiscard]] kesto::Status createTotals();
-    [[nodiscard]] kesto::Status create(Device& device);
+    // Publish what is not published; all of the channels or none. The latter two answer why they could not, else
+    // nothing.
+    void publish();
+    [[nodiscard]] std::string publishTotals();
+    [[nodiscard]] std::string publish(Device& device);
+    // Of the driver, and why it is not there.
+    [[nodiscard]] std::string place() const;
+    [[nodiscard]] std::string describe(const std::string& reason) const;
+
+    [[nodiscard]] kesto::Status create(TotalChannels& totals);
+    [[nodiscard]] kesto::Status create(DeviceOwnChannels& channels, const Device& device);
+    [[nodiscard]] kesto::Status create(CycleChannels& channels, Direction direction, const std::string& subgroup);
     [[nodiscard]] std::string freeSubgroup(const std::string& name) const;
     [[nodiscard]] Device* find(DeviceSerial serial);
     void countRunning();
 
     const Diagnostics& diagnostics_;
+    const std::string root_; // as it was given
+    std::string problem_; // that was said last
+    std::string driver_;
     kesto::Publisher publisher_;
-    std::array<CycleChannels, 2> totals_; // by direction
-    kesto::StateChannel anyRuns_;
-    kesto::HistogramChannel startTimes_;
+    std::optional<TotalChannels> totals_; // while they are published
     std::unordered_map<DeviceSerial, Device> devices_;
 };
 

@@ -69,6 +69,9 @@ KESTO_API kesto_status kesto_publisher_flush(kesto_publisher* publisher);
 // sessions first. Null is allowed.
 KESTO_API void kesto_publisher_free(kesto_publisher* publisher);
 
+// Where its channel tree is, for messages to people. Valid until the publisher is freed; null when the publisher is.
+KESTO_API const char* kesto_publisher_root(const kesto_publisher* publisher);
+
 // What became of the files since the publisher was opened. A file that could not be written is tried again.
 typedef struct kesto_publisher_statistics {
     uint64_t files_written;

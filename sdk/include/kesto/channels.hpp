@@ -63,6 +63,13 @@ public:
     // Writes what has changed, and how long states have lasted, before it returns.
     Status flush() noexcept { return Status(kesto_publisher_flush(publisher_)); }
 
+    // Where the channel tree is; empty while it is not open.
+    [[nodiscard]] std::string root() const
+    {
+        const char* const root = kesto_publisher_root(publisher_);
+        return root == nullptr ? "" : root;
+    }
+
     [[nodiscard]] PublisherStatistics statistics() const noexcept
     {
         PublisherStatistics statistics{};

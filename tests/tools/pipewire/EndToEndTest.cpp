@@ -9,6 +9,7 @@
 #include <gtest/gtest.h>
 
 #include <sqlite3.h>
+#include <unistd.h>
 
 #include <chrono>
 #include <csignal>
@@ -145,6 +146,7 @@ protected:
     // Sound takes its time, and how much of it is what the test is about.
     static void letItPlay(std::chrono::milliseconds duration) { std::this_thread::sleep_for(duration); }
 
+    const std::string driver = "pipewire-" + std::to_string(::geteuid());
     HeadlessPipeWire server;
     const support::TemporaryDirectory directory;
     std::unique_ptr<Program> service;
@@ -281,12 +283,12 @@ TEST_F(EndToEndTest, ASessionsEndTellsWhatTheDevicesDid)
     ASSERT_TRUE(comes("kesto.Cavlet.Simple"));
     ASSERT_TRUE(comes("kesto.Cavlet.Histogram"));
 
-    const auto cycles = values("kesto.Cavlet.Simple", "pipewire_Tx_null-sink_Simple_cycles");
+    const auto cycles = values("kesto.Cavlet.Simple", driver + "_Tx_null-sink_Simple_cycles");
     EXPECT_GT(std::stoi(cycles.at(0)), 20);
-    EXPECT_EQ(values("kesto.Cavlet.Simple", "pipewire_Tx_Simple_cycles"), cycles);
-    EXPECT_THAT(values("kesto.Cavlet.Histogram", "pipewire_Tx_null-sink_Histogram_work"),
+    EXPECT_EQ(values("kesto.Cavlet.Simple", driver + "_Tx_Simple_cycles"), cycles);
+    EXPECT_THAT(values("kesto.Cavlet.Histogram", driver + "_Tx_null-sink_Histogram_work"),
                 ElementsAre(testing::HasSubstr("unit=us::")));
-    EXPECT_THAT(values("kesto.Cavlet.State", "pipewire_Speaker_null-sink_State_state"),
+    EXPECT_THAT(values("kesto.Cavlet.State", driver + "_Speaker_null-sink_State_state"),
                 ElementsAre(testing::HasSubstr("name:Running,")));
 }
 
@@ -300,7 +302,39 @@ TEST_F(EndToEndTest, ATerminatedReporterStillTellsWhatTheDevicesDid)
     EXPECT_EQ(reporter->wait(), 0);
 
     ASSERT_TRUE(comes("kesto.Cavlet.Simple"));
-    EXPECT_GT(std::stoi(values("kesto.Cavlet.Simple", "pipewire_Tx_null-sink_Simple_cycles").at(0)), 20);
+    EXPECT_GT(std::stoi(values("kesto.Cavlet.Simple", driver + "_Tx_null-sink_Simple_cycles").at(0)), 20);
+}
+
+TEST_F(EndToEndTest, AReporterThatWasKilledLeavesNoDevicesBehind)
+{
+    const auto file = [this](const std::string& path) { return directory / "channels" / driver / path; };
+    const auto isThere = [](const std::filesystem::path& path) {
+        const auto end = std::chrono::steady_clock::now() + patience;
+        while (!std::filesystem::exists(path) && std::chrono::steady_clock::now() < end)
+            std::this_thread::sleep_for(5ms);
+        return std::filesystem::exists(path);
+    };
+    for (int twin = 0; twin < 2; ++twin)
+        server.runToEnd({"pactl", "load-module", "module-null-sink", "sink_name=dock"});
+    ASSERT_TRUE(isThere(file("StateTransitionTimes_ms/dock/to Running")));
+    ASSERT_TRUE(isThere(file("StateTransitionTimes_ms/dock#2/to Running")));
+    reporter->kill(SIGKILL);
+    reporter->wait();
+    server.runToEnd({"pactl", "unload-module", "module-null-sink"});
+    EXPECT_TRUE(std::filesystem::exists(file("Speaker/dock/state")));
+    startReporter();
+    startServiceThatFindsChannels();
+    EXPECT_FALSE(std::filesystem::exists(file("Speaker/dock")));
+    EXPECT_FALSE(std::filesystem::exists(file("Speaker/dock#2")));
+    {
+        const auto player = server.playTone("Music");
+        ASSERT_TRUE(comes("kesto.Playback.Start"));
+    }
+    ASSERT_TRUE(comes("kesto.Cavlet.State"));
+
+    EXPECT_THAT(values("kesto.Cavlet.State", driver + "_Speaker_null-sink_State_state"),
+                ElementsAre(testing::HasSubstr("name:")));
+    EXPECT_THAT(select("payload", "name LIKE '%Cavlet%' AND payload LIKE '%dock%'"), IsEmpty());
 }
 
 TEST_F(EndToEndTest, AnIdleReporterWakesForNothing)
