@@ -77,9 +77,10 @@ void measureAnalysis(const Options& options, Report& report)
     KestoReportingMessageStore store(KestoReportingStorageBudget::service());
     sendMessages([&](const auto& message) { use(store.record(sampleCategory, sampleType, message)); });
     const std::optional<foundation::Value> process("player");
-    const auto times =
-        compete(options, "combining and volume analysis",
-                millisecondsOf([&] { use(KestoReportingSession::createVolumeMessages(store, process, 0.5)); }));
+    const auto times = compete(options, "combining and volume analysis", millisecondsOf([&] {
+                                   KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+                                   use(KestoReportingSession::createVolumeMessages(store, process, 0.5, share));
+                               }));
     std::vector<double> each;
     for (const double milliseconds : times[0].figures())
         each.push_back(milliseconds * 1e6 / messageCount);

@@ -10,6 +10,8 @@
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
+#include <utility>
+
 namespace {
 
 // As much of the application's name as a log line needs: the client chooses it, and all sessions stand in one line.
@@ -169,11 +171,15 @@ void KestoReportingSession::sendVolumeEvents()
     const auto application = KestoReportingUtilityRetrieveAppName(configuration());
     const auto process = application.isNull() ? std::nullopt : std::optional(application);
     const double minimumPlaytime = KestoReportingUtilityVolumeMinimumPlayingTime(serviceType_);
-    const auto volumeEvents = createVolumeMessages(*store(), process, minimumPlaytime);
+    KestoReportingStorageShare share(budget_);
+    auto volumeEvents = createVolumeMessages(*store(), process, minimumPlaytime, share);
     if (volumeEvents.empty())
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Default, "sending volume event for reporter {}", reporterID_);
-    for (const auto& volumeEvent : volumeEvents) {
+    const std::size_t paidForEach = share.bytes() / volumeEvents.size();
+    for (auto& next : volumeEvents) {
+        const auto volumeEvent = std::exchange(next, {}); // it goes once the store has it
+        share.shrink(paidForEach);
         sendMessage(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
         KestoReportingFennicBridge::handleEvent(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,
                                                 shared_from_this());

@@ -100,11 +100,16 @@ public:
     combineRapidMessages(const KestoReportingMessageStore& messages, std::span<const std::string_view> keysToCombine,
                          double maximumPausetime);
     // One event for each stretch of more than so many seconds during which output ran unchanged. Without a process
-    // there are none. Events that would take more than `mostVolumeEventBytes` together are lost, with a log line.
+    // there are none. The share, which is empty, pays for them from now on, but for the first `unpaidVolumeEventBytes`.
+    // Events that would take more than `mostVolumeEventBytes` together, or more than the budget has, are lost, with a
+    // log line.
     [[nodiscard]] static std::vector<foundation::Dictionary>
     createVolumeMessages(const KestoReportingMessageStore& messages, const std::optional<foundation::Value>& process,
-                         double minimumPlaytime);
+                         double minimumPlaytime, KestoReportingStorageShare& share);
     static constexpr std::size_t mostVolumeEventBytes = std::size_t{64} << 20;
+    // One session ends at a time, so that a few events take nothing from anybody: a client that has used up its budget
+    // still learns what was played.
+    static constexpr std::size_t unpaidVolumeEventBytes = std::size_t{64} << 10;
 
     // Summary files of all sessions that are kept; beyond these the oldest go.
     static constexpr std::size_t mostSummaryFiles = 4096;

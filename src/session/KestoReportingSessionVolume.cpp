@@ -10,6 +10,7 @@
 
 #include <algorithm>
 #include <array>
+#include <deque>
 
 namespace {
 
@@ -25,6 +26,30 @@ constexpr double longestPause = 2.0; // seconds, within a burst
 constexpr std::array keysOfAnEvent{
     Key::SelectedFormat,        Key::ActiveDevices, Key::Volume,          Key::SpatialAudioAccessoryFeature,
     Key::SpatializationEnabled, Key::RingerState,   Key::ChannelsPerFrame};
+
+// The keys of all events, once for all of them.
+const foundation::Reference<foundation::DictionaryShape>& shapeOfEvents()
+{
+    static const auto shape = foundation::DictionaryShape::make({
+        KestoReportingVolumeKeyName(Key::SelectedFormat),
+        KestoReportingVolumeKeyName(Key::ActiveDevices),
+        KestoReportingHostApplicationKey,
+        KestoReportingVolumeKeyName(Key::Volume),
+        "PomoSessionVolumeBucketed",
+        "play_seconds",
+        KestoReportingVolumeKeyName(Key::SpatialAudioAccessoryFeature),
+        KestoReportingVolumeKeyName(Key::SpatializationEnabled),
+        KestoReportingVolumeKeyName(Key::RingerState),
+        KestoReportingVolumeKeyName(Key::ChannelsPerFrame),
+        "play_secondsBucketed",
+        "msgidx",
+        "msgcnt",
+    });
+    return shape;
+}
+
+// The values in their order, the count still missing.
+using ValuesOfEvent = std::array<Value, 13>;
 
 // What folding bursts needs to know of the payloads as the analysis sees them.
 struct VolumePayloads {
@@ -62,9 +87,10 @@ struct WholePayloads {
 // Replays payloads and gathers the events of the stretches that end.
 class VolumeAnalysis {
 public:
-    VolumeAnalysis(const std::optional<Value>& process, double minimumPlaytime)
+    VolumeAnalysis(const std::optional<Value>& process, double minimumPlaytime, KestoReportingStorageShare& share)
         : process_(process),
-          minimumPlaytime_(minimumPlaytime)
+          minimumPlaytime_(minimumPlaytime),
+          share_(share)
     {
         const auto begin = [this](Key key, const Value& value) { state_.set(key, constants_.keep(value)); };
         begin(Key::SelectedFormat, "unknown");
@@ -97,20 +123,23 @@ public:
         merge(payload);
     }
 
-    // The events, each with their number.
+    // The events, each with their number. What they were made of goes as they come.
     std::vector<Dictionary> finish() &&
     {
-        static const foundation::String countKey("msgcnt");
+        const std::size_t count = events_.size();
         std::vector<Dictionary> events;
-        events.reserve(events_.size());
-        for (Dictionary::Entries& event : events_) {
-            event.push_back({countKey, events_.size()});
-            events.emplace_back(std::move(event));
+        events.reserve(count);
+        for (; !events_.empty(); events_.pop_front()) {
+            events_.front().back() = count;
+            events.emplace_back(shapeOfEvents(), events_.front());
         }
-        if (eventsLost_ != 0)
+        if (eventsBeyondBound_ != 0)
             KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Error,
-                      "{} volume events are lost: with them there would be more than {} bytes", eventsLost_,
+                      "{} volume events are lost: with them there would be more than {} bytes", eventsBeyondBound_,
                       KestoReportingSession::mostVolumeEventBytes);
+        if (eventsUnpaid_ != 0)
+            KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Error,
+                      "{} volume events are lost for want of memory", eventsUnpaid_);
         return events;
     }
 
@@ -166,62 +195,69 @@ private:
                       events_.size());
             return;
         }
-        if (!hasRoomForEvent()) {
-            ++eventsLost_;
+        if (!makeRoomForEvent())
             return;
-        }
         events_.push_back(makeEvent(playTime));
         KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Debug,
                   "added volume message {{ func={}, action=add, count={} }}", functionName, events_.size());
     }
 
     // Each is written several times, text that it shares with others too: what all take together has a bound.
-    bool hasRoomForEvent()
+    bool makeRoomForEvent()
     {
         constexpr std::size_t bytesOfAnEvent = 256; // beside what a client says
         std::size_t bytes = bytesOfAnEvent + process_->roughBytes();
         for (const Key key : keysOfAnEvent)
             bytes += stateValue(key).roughBytes();
-        if (bytes > KestoReportingSession::mostVolumeEventBytes - bytesOfEvents_)
-            return false;
-        bytesOfEvents_ += bytes;
-        return true;
+        const bool isWithinBound = bytes <= KestoReportingSession::mostVolumeEventBytes - bytesOfEvents_;
+        const bool isPaidFor = isWithinBound && payFor(bytesOfEvents_ + bytes);
+        if (isPaidFor)
+            bytesOfEvents_ += bytes;
+        else
+            ++(isWithinBound ? eventsUnpaid_ : eventsBeyondBound_);
+        return isPaidFor;
     }
 
-    [[nodiscard]] Dictionary::Entries makeEvent(double playTime)
+    bool payFor(std::size_t bytes)
+    {
+        constexpr std::size_t paidAtOnce = std::size_t{16} << 10;
+        const std::size_t paid = share_.bytes() + KestoReportingSession::unpaidVolumeEventBytes;
+        return bytes <= paid || share_.grow(std::max(bytes - paid, paidAtOnce));
+    }
+
+    [[nodiscard]] ValuesOfEvent makeEvent(double playTime)
     {
         const auto bucketed = [](double number, std::span<const double> buckets, unsigned places) {
             return Value(*KestoReportingUtilityBucketNumberToString(number, buckets, places));
         };
-        const auto fromState = [this](Key key) {
-            return foundation::DictionaryEntry{KestoReportingVolumeKeyName(key), stateValue(key)};
-        };
-        return {fromState(Key::SelectedFormat),
-                fromState(Key::ActiveDevices),
-                {KestoReportingHostApplicationKey, *process_},
-                fromState(Key::Volume),
-                {"PomoSessionVolumeBucketed",
-                 bucketed(stateValue(Key::Volume).asDouble(), KestoReportingUtilityBucketNumberToStringVolumes, 4)},
-                {"play_seconds", static_cast<float>(playTime)},
-                fromState(Key::SpatialAudioAccessoryFeature),
-                fromState(Key::SpatializationEnabled),
-                fromState(Key::RingerState),
-                fromState(Key::ChannelsPerFrame),
-                {"play_secondsBucketed", bucketed(playTime, KestoReportingUtilityBucketNumberToStringTimes, 0)},
-                {"msgidx", events_.size() + 1}};
+        return {stateValue(Key::SelectedFormat),
+                stateValue(Key::ActiveDevices),
+                *process_,
+                stateValue(Key::Volume),
+                bucketed(stateValue(Key::Volume).asDouble(), KestoReportingUtilityBucketNumberToStringVolumes, 4),
+                static_cast<float>(playTime),
+                stateValue(Key::SpatialAudioAccessoryFeature),
+                stateValue(Key::SpatializationEnabled),
+                stateValue(Key::RingerState),
+                stateValue(Key::ChannelsPerFrame),
+                bucketed(playTime, KestoReportingUtilityBucketNumberToStringTimes, 0),
+                events_.size() + 1,
+                {}};
     }
 
     const std::optional<Value>& process_;
     const double minimumPlaytime_;
+    KestoReportingStorageShare& share_;
     KestoReportingVolumeFieldsReader constants_;
     Fields state_;
     std::array<std::optional<Value>, static_cast<std::size_t>(Key::Count)> stateValues_; // those that were asked for
     bool stateIsRunning_ = false;
     bool isRunning_ = false;
     std::optional<double> segmentStart_;
-    std::vector<Dictionary::Entries> events_;
+    std::deque<ValuesOfEvent> events_;
     std::size_t bytesOfEvents_ = 0;
-    std::uint64_t eventsLost_ = 0;
+    std::uint64_t eventsBeyondBound_ = 0;
+    std::uint64_t eventsUnpaid_ = 0;
 };
 
 } // namespace
@@ -239,11 +275,12 @@ std::vector<Dictionary> KestoReportingSession::combineRapidMessages(const KestoR
 
 std::vector<Dictionary> KestoReportingSession::createVolumeMessages(const KestoReportingMessageStore& messages,
                                                                     const std::optional<Value>& process,
-                                                                    double minimumPlaytime)
+                                                                    double minimumPlaytime,
+                                                                    KestoReportingStorageShare& share)
 {
     KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Debug, "entering createVolumeMessages {}", functionName);
     VolumePayloads payloads;
-    VolumeAnalysis analysis(process, minimumPlaytime);
+    VolumeAnalysis analysis(process, minimumPlaytime, share);
     KestoReportingCombineRapidMessages(messages, longestPause, payloads,
                                        [&](const Fields& payload) { analysis.process(payload); });
     auto events = std::move(analysis).finish();

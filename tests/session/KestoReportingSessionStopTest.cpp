@@ -258,6 +258,29 @@ TEST_F(SessionStop, HandsVolumeEventsToTheBridgeEvenWhenThereIsNoMemoryToRecordT
     EXPECT_EQ(budget->taken(), 0U);
 }
 
+TEST_F(SessionStop, PaysForVolumeEventsFromItsBudgetUntilTheyAreRecorded)
+{
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 20);
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
+    session->start();
+    send(0, {{"session_output_running", true}});
+    for (int change = 1; change <= 3000; ++change)
+        send(change, {{"PomoSessionVolume", change % 2}});
+    ASSERT_LT(budget->taken(), std::size_t{1} << 19);
+    platform.log.clear();
+    session->stop();
+    const auto events = platform.analytics.payloads("com.quarn.kesto.Volume.Summary");
+    EXPECT_GT(events.size(), 900U);
+    EXPECT_THAT(platform.log.lines("keri"),
+                Contains(IsLine(Error, "keri",
+                                std::to_string(2999 - events.size()) + " volume events are lost for want of memory")));
+    ASSERT_THAT(platform.fileSystem.files, SizeIs(1));
+    EXPECT_THAT(platform.fileSystem.files.begin()->second,
+                HasSubstr("\"Volume_Summary_" + std::to_string(events.size() / 2) + '"'))
+        << "what is paid for an event makes room for its record";
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
 TEST_F(CustomerSessionStop, MeasuresNothingAndWritesNoFileButRecordsTheSummary)
 {
     play();

@@ -345,7 +345,8 @@ TEST_F(LargeSummary, IsSeenByTheOtherDerivationsToo)
     ASSERT_EQ(store.record(playback, 2, {{"session_output_running", false}, {"kestoreporting_timestamp", 11}}),
               KestoReportingMessageStore::Outcome::Recorded);
     const Messages messages = messagesOf(store);
-    const Messages events = KestoReportingSession::createVolumeMessages(store, Value("player"), 0.5);
+    KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+    const Messages events = KestoReportingSession::createVolumeMessages(store, Value("player"), 0.5, share);
     ASSERT_THAT(events, SizeIs(1));
     EXPECT_EQ(*events[0].find("active_devices"), Value(text));
     EXPECT_EQ(textsOf(events), textsOf(naive::createVolumeMessages(messages, Value("player"), 0.5).events));

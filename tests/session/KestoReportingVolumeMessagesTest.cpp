@@ -1,4 +1,5 @@
 // Volume events: which stretches of playing become one, what it says, and what is logged about it.
+#include "session/AllocatedBytes.h"
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
 #include "session/NaiveAggregation.h"
@@ -39,7 +40,8 @@ protected:
     static Messages create(const Messages& payloads, const std::optional<Value>& process = Value("player"),
                            double minimumPlaytime = 0.5)
     {
-        return KestoReportingSession::createVolumeMessages(*storeOf(payloads), process, minimumPlaytime);
+        KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+        return KestoReportingSession::createVolumeMessages(*storeOf(payloads), process, minimumPlaytime, share);
     }
 
     // The play times, as texts.
@@ -468,7 +470,8 @@ RC_GTEST_PROP(VolumeMessagesOfAnyStore, AreWhatTheirDefinitionMakesOfIt, ())
     for (const Messages& payloads : *generated::manyPayloads(30)) {
         const auto store = storeOf(payloads);
         platform.log.clear();
-        const Messages events = KestoReportingSession::createVolumeMessages(*store, process, minimum);
+        KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+        const Messages events = KestoReportingSession::createVolumeMessages(*store, process, minimum, share);
         const auto expected = naive::createVolumeMessages(messagesOf(*store), process, minimum);
         RC_ASSERT(textsOf(events) == textsOf(expected.events));
         std::vector<std::string> said;
@@ -539,6 +542,76 @@ TEST_F(VolumeMessages, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
                                              + " volume events are lost: with them there would be more than 67108864 "
                                                "bytes"))
                     .Times(1));
+}
+
+// Half a volume each second, and another half the next.
+std::unique_ptr<KestoReportingMessageStore> storeOfVolumeChanges(int changes)
+{
+    Messages payloads{startAt(0)};
+    for (int change = 1; change <= changes; ++change)
+        payloads.push_back(at(change, {{"PomoSessionVolume", change % 2}}));
+    return storeOf(payloads);
+}
+
+TEST_F(VolumeMessages, AreMadeWithinWhatIsPaidForThem)
+{
+    platform.log.setThreshold(Error);
+    const auto store = storeOfVolumeChanges(200'000);
+    KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+    const auto before = allocatedBytes();
+    forgetMostAllocatedBytes();
+    const auto events = KestoReportingSession::createVolumeMessages(*store, Value("player"), 0.5, share);
+    EXPECT_LE(mostAllocatedBytes() - before, static_cast<std::ptrdiff_t>(share.bytes()));
+    EXPECT_LE(share.bytes(), KestoReportingSession::mostVolumeEventBytes);
+    EXPECT_GT(events.size(), 100'000U);
+}
+
+TEST_F(VolumeMessages, ShareTheirKeys)
+{
+    const auto events = create({startAt(0), at(30, {{"PomoSessionVolume", 0.75}}), stopAt(100)});
+    ASSERT_THAT(events, SizeIs(2));
+    EXPECT_EQ(events[0].shape().get(), events[1].shape().get());
+    const auto later = create({startAt(0), stopAt(100)});
+    EXPECT_EQ(later.at(0).shape().get(), events[0].shape().get());
+}
+
+TEST_F(VolumeMessages, ArePaidForAsLongAsTheShareIsThere)
+{
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 30);
+    const auto store = storeOfVolumeChanges(10'000);
+    {
+        KestoReportingStorageShare share(budget);
+        const auto events = KestoReportingSession::createVolumeMessages(*store, Value("player"), 0.5, share);
+        EXPECT_THAT(events, SizeIs(10'000));
+        EXPECT_GE(budget->taken(), events.size() * 256);
+    }
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
+TEST_F(VolumeMessages, AreLostWhenTheBudgetHasNoRoomForThem)
+{
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 20);
+    const auto store = storeOfVolumeChanges(10'000);
+    KestoReportingStorageShare share(budget);
+    const auto events = KestoReportingSession::createVolumeMessages(*store, Value("player"), 0.5, share);
+    EXPECT_LE(budget->taken(), std::size_t{1} << 20);
+    ASSERT_GT(events.size(), 1000U);
+    ASSERT_LT(events.size(), 4000U);
+    EXPECT_EQ(*events.front().find("msgcnt"), Value(events.size()));
+    EXPECT_THAT(
+        platform.log.lines("keri"),
+        testing::Contains(IsLine(Error, "keri",
+                                 std::to_string(10'000 - events.size()) + " volume events are lost for want of memory"))
+            .Times(1));
+}
+
+// Only one session ends at a time, so that a few take nothing from anybody.
+TEST_F(VolumeMessages, AreThereInSmallNumbersEvenWhenTheBudgetIsUsedUp)
+{
+    KestoReportingStorageShare share(std::make_shared<KestoReportingStorageBudget>(0));
+    const auto store = storeOfVolumeChanges(50);
+    EXPECT_THAT(KestoReportingSession::createVolumeMessages(*store, Value("player"), 0.5, share), SizeIs(50));
+    EXPECT_EQ(share.bytes(), 0U);
 }
 
 } // namespace

@@ -23,3 +23,17 @@ constexpr bool threadSanitizerWatches = false;
     if (!threadSanitizerWatches) {             \
     } else                                     \
         GTEST_SKIP() << "the thread sanitizer has a thread of its own, that does not rest"
+
+// The address sanitizer keeps what is released, to see who touches it, and the thread sanitizer notes of all memory who
+// touched it last.
+#if defined(__SANITIZE_ADDRESS__)
+constexpr bool addressSanitizerWatches = true;
+#elif defined(__has_feature)
+constexpr bool addressSanitizerWatches = __has_feature(address_sanitizer);
+#else
+constexpr bool addressSanitizerWatches = false;
+#endif
+#define KESTO_SKIP_WHERE_MEMORY_IS_WATCHED()                   \
+    if (!addressSanitizerWatches && !threadSanitizerWatches) { \
+    } else                                                     \
+        GTEST_SKIP() << "the sanitizer takes memory of its own"
