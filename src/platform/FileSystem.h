@@ -39,8 +39,8 @@ public:
     // The folder below which diagnostic files are kept. It exists when the service starts.
     [[nodiscard]] virtual std::filesystem::path diagnosticLogRoot() const = 0;
     // Makes the folder and those above it that are missing, with exactly these permissions whatever the umask. Those
-    // that exist stay as they are. The root is made again, as it was, if it has gone. `errc::not_a_directory` where a file
-    // stands.
+    // that exist stay as they are. The root is made again, as it was, if it has gone. `errc::not_a_directory` where a
+    // file stands.
     [[nodiscard]] virtual std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
                                                                                  unsigned permissions) = 0;
     // Begins a file in a folder that exists. Several of one name may be in the making: the last that is committed

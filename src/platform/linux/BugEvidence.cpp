@@ -112,8 +112,8 @@ FileDescriptor openFolder(const std::filesystem::path& path)
 
 } // namespace
 
-Dictionary processEvidence(const std::filesystem::path& proc, std::string_view processName,
-                           std::int64_t first, const BugEvidenceLimits& limits)
+Dictionary processEvidence(const std::filesystem::path& proc, std::string_view processName, std::int64_t first,
+                           const BugEvidenceLimits& limits)
 {
     std::int64_t found = 0;
     std::vector<Value> processes;

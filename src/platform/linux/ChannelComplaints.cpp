@@ -58,7 +58,7 @@ void ChannelComplaints::sayProblems(const std::vector<ChannelProblem>& problems)
 
 void ChannelComplaints::sayWhatIsLeftOut(LeftOutChannels leftOut) const
 {
-    for (std::size_t LeftOutChannels::*bound :
+    for (std::size_t LeftOutChannels::* bound :
          {&LeftOutChannels::beyondChannels, &LeftOutChannels::beyondBytes, &LeftOutChannels::beyondNames})
         if (anyRemembers([&](const Findings& each) { return each.leftOut.*bound > 0; }))
             leftOut.*bound = 0;

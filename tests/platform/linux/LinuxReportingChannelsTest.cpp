@@ -126,22 +126,24 @@ TEST_F(LinuxReportingChannelsTest, NameTheBoundThatASampleMet)
     for (std::size_t index = 0; index < fitting + 2; ++index)
         publish("amp/Speaker/-/" + std::to_string(index), large);
     const auto subscribed = subscribe("Speaker", std::nullopt);
-    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl",
-                                               "channels left out of a sample: 2, beyond the 2097152 bytes of files "
-                                               "that it takes")));
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl",
+                                   "channels left out of a sample: 2, beyond the 2097152 bytes of files "
+                                   "that it takes")));
     EXPECT_THAT(sample(subscribed).channels, SizeIs(fitting));
     EXPECT_THAT(log.take(), IsEmpty()) << "once";
 
     LinuxReportingChannels few(root, sound, ProviderLog(log), {.channels = 10});
     EXPECT_EQ(few.channelCount(*few.copyChannelsInGroup("Speaker", std::nullopt).channels), 10U);
-    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl",
-                                               "channels left out of a sample: 62, beyond the 10 that it takes")));
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl", "channels left out of a sample: 62, beyond the 10 that it takes")));
 
     LinuxReportingChannels blind(root, sound, ProviderLog(log), {.names = 4});
     EXPECT_EQ(blind.channelCount(*blind.copyChannelsInGroup("Speaker", std::nullopt).channels), 0U);
-    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl",
-                                               "folders left out of a sample, in part or whole: at least 1, beyond the "
-                                               "4 names that it looks at")));
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl",
+                                   "folders left out of a sample, in part or whole: at least 1, beyond the "
+                                   "4 names that it looks at")));
 }
 
 // What every question meets, as the service asks them when it starts.
