@@ -17,7 +17,8 @@ class PerformanceFile {
 public:
     virtual ~PerformanceFile() = default;
     virtual void write(std::string_view name, double value, PerformanceUnit unit) = 0;
-    // Says something of all measurements together, such as how many of them are missing.
+    // Says something of all measurements together, such as how many of them are missing; once for each key. A value
+    // that holds a number which is not finite is kept as null.
     virtual void remark(std::string_view key, const foundation::Value& value) = 0;
 };
 

@@ -104,10 +104,15 @@ protected:
         EXPECT_EQ(helper.errors(), "");
         EXPECT_TRUE(std::filesystem::is_empty(tree));
     }
-    static std::string contentOf(const std::string& file)
+    // What a channel's file says behind the line that names its owner.
+    static std::string contentOf(const std::string& path)
     {
+        std::ifstream file(path);
+        std::string owner;
+        std::getline(file, owner);
+        EXPECT_THAT(owner, testing::MatchesRegex("owner [0-9a-f]{16}"));
         std::ostringstream text;
-        text << std::ifstream(file).rdbuf();
+        text << file.rdbuf();
         return text.str();
     }
 

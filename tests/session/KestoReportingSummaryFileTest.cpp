@@ -410,7 +410,7 @@ TEST_F(SummaryFile, SaysWhatJsonCannotBeforeItSaysThatItsDirectoryCouldNotBeMade
                 ElementsAre(IsLine(Error, "kerr", "dataWithJSONObject: a number is not finite"),
                             IsLine(Error, "kerr",
                                    "can't create logging directory at /diagnostics/Audio/Reporting: Permission denied"),
-                            IsLine(Error, "kerr", "jsonOutput writeToURL: Permission denied")));
+                            IsLine(Error, "kerr", "jsonOutput writeToURL: No such file or directory")));
 }
 
 TEST_F(SummaryFile, IsMissedWithOneLineWhenItCannotBeWritten)

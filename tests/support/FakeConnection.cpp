@@ -119,6 +119,7 @@ std::string FakeConnection::description() const
 
 void FakeConnection::send(std::string frame)
 {
+    ++sent_;
     FakeWorkQueues::afterTurn([self = shared_from_this(), frame = std::move(frame)] {
         if (!self->isInterrupted_ && !self->isOver_)
             self->received_.push_back(self->decoded(frame));

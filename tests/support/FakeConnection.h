@@ -30,6 +30,8 @@ public:
     std::expected<void, Violation> readOn();
     // The frames that came back.
     [[nodiscard]] const std::vector<foundation::Array>& received() const { return received_; }
+    // How many frames were sent, those of a turn that goes on included.
+    [[nodiscard]] std::size_t sent() const { return sent_; }
     // Calls that nobody has finished working on.
     [[nodiscard]] std::size_t unansweredCalls() const { return unansweredCalls_; }
 
@@ -71,6 +73,7 @@ private:
     foundation::CborDecoder decoder_;
     std::deque<std::string> unread_; // calls
     std::vector<foundation::Array> received_;
+    std::size_t sent_ = 0;
     std::size_t unansweredCalls_ = 0;
     std::size_t unansweredBytes_ = 0;
 };

@@ -2,6 +2,8 @@
 // the root.
 #include "support/FakeFiles.h"
 
+#include "foundation/Json.h"
+
 #include <algorithm>
 #include <functional>
 #include <utility>
@@ -149,7 +151,9 @@ public:
     }
     void remark(std::string_view key, const foundation::Value& value) override
     {
-        file_->remarks.insert_or_assign(std::string(key), value);
+        std::string json;
+        file_->remarks.insert_or_assign(std::string(key),
+                                        foundation::appendJson(value, json) ? value : foundation::Value());
     }
 
 private:

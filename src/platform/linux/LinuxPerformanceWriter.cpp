@@ -74,7 +74,8 @@ public:
     void remark(std::string_view key, const foundation::Value& value) override
     {
         remarks_.append(",").append(jsonText(key)).append(":");
-        (void)foundation::appendJson(value, remarks_);
+        if (!foundation::appendJson(value, remarks_))
+            remarks_ += "null"; // JSON has no word for it
     }
 
 private:

@@ -312,8 +312,9 @@ TEST_P(ReportingChannelsContract, TellApartChannelsOfOneNameInSeveralPlaces)
     const auto before = sample(subscribed);
     subject->publish(in("Speaker", "Stats", simple("a", 103)));
     std::map<std::string, std::int64_t> values;
-    for (const auto& each : subject->channels().createDifference(before, sample(subscribed)).value().channels)
-        values[*each.subgroup] = each.value;
+    const auto difference = subject->channels().createDifference(before, sample(subscribed)).value();
+    for (const auto& each : difference.channels)
+        values[each.subgroup.value()] = each.value;
     EXPECT_THAT(values, ElementsAre(Pair("MCA", 0), Pair("Stats", 3)));
 }
 
