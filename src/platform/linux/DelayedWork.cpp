@@ -26,16 +26,18 @@ void DelayedWork::add(Clock::time_point due, WorkQueue& queue, WorkItem item)
     const foundation::Lock lock(lock_);
     const auto added = schedule_.emplace(due, Delayed{queue, std::move(item)});
     if (!thread_.joinable())
-        start();
+        static_cast<void>(start()); // if there is no thread to spare, the next item tries again
     else if (added == schedule_.begin())
         changed_.notifyOne();
 }
 
-void DelayedWork::start()
+bool DelayedWork::start()
 {
     try {
         thread_ = startThread("delayed work", QualityOfService::Default, [this] { run(); });
-    } catch (const std::system_error&) { // the next item tries again
+        return true;
+    } catch (const std::system_error&) {
+        return false;
     }
 }
 

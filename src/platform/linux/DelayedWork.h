@@ -33,7 +33,7 @@ private:
     };
     using Schedule = std::multimap<Clock::time_point, Delayed>; // of equal times, the first added comes first
 
-    void start() KESTO_REQUIRES(lock_);
+    [[nodiscard]] bool start() KESTO_REQUIRES(lock_);
     void run();
     [[nodiscard]] Schedule::node_type waitForDue();
 
