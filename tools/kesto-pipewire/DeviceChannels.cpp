@@ -134,14 +134,14 @@ std::string DeviceChannels::publish(Device& device)
 
 kesto::Status DeviceChannels::create(TotalChannels& totals)
 {
-    auto& [cycles, anyRuns, startTimes] = totals;
-    return createAll([&] { return create(cycles[0], Direction::Output, ""); },
-                     [&] { return create(cycles[1], Direction::Input, ""); },
-                     [&] { return anyRuns.create(publisher_, {driver_, "Speaker", "", "any"}, {"Idle", "Running"}); },
-                     [&] {
-                         return startTimes.create(publisher_, {driver_, "StateTransitionTimes_ms", "", "to Running"},
-                                                  "ms", startBounds);
-                     });
+    return createAll(
+        [&] { return create(totals.cycles[0], Direction::Output, ""); },
+        [&] { return create(totals.cycles[1], Direction::Input, ""); },
+        [&] { return totals.anyRuns.create(publisher_, {driver_, "Speaker", "", "any"}, {"Idle", "Running"}); },
+        [&] {
+            return totals.startTimes.create(publisher_, {driver_, "StateTransitionTimes_ms", "", "to Running"}, "ms",
+                                            startBounds);
+        });
 }
 
 kesto::Status DeviceChannels::create(DeviceOwnChannels& channels, const Device& device)
