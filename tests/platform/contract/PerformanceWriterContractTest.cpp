@@ -68,7 +68,8 @@ public:
                           .version = json.find("version")->exactly<std::uint32_t>().value(),
                           .measurements = {},
                           .remarks = {}};
-        for (const auto& record : json.find("records")->array().value()) {
+        const auto records = json.find("records")->array().value(); // kept: the loop would outlive the temporary
+        for (const auto& record : records) {
             const auto fields = record.dictionary().value();
             EXPECT_EQ(fields.find("unit")->stringView(), "ns");
             document.measurements.push_back({std::string(fields.find("name")->stringView()),
