@@ -26,6 +26,8 @@ void StringBuilder::repeatLast(std::size_t size, std::size_t times)
 {
     constexpr std::size_t longPattern = std::size_t{16} << 10;
     std::size_t missing = size * times;
+    if (missing == 0)
+        return;
     if (capacity_ - size_ < missing)
         grow(missing);
     const char* const pattern = bytes() + size_ - size;

@@ -19,7 +19,7 @@ using testing::HasSubstr;
 using testing::MatchesRegex;
 using testing::SizeIs;
 
-const Value null;
+const Value null{};
 constexpr int playback = 4;
 constexpr int typeStart = 1;
 constexpr int typeStop = 2;

@@ -36,7 +36,7 @@ Value valuesOf(const kesto::Answer& answer)
         std::vector<Value> reporters;
         for (const kesto::ReporterID reporter : answer.reporters())
             reporters.emplace_back(reporter);
-        return Array{Array(std::move(reporters))};
+        return Array{Value(Array(std::move(reporters)))}; // a list in a list: without Value some compilers copy it
     }
     default: return Array{answer.success()};
     }

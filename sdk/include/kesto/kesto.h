@@ -43,8 +43,15 @@ extern "C" {
 
 // ---- Status ----
 
+// New numbers may come in all that is counted here. C takes any; C++ does where the type of the numbers is named.
+#ifdef __cplusplus
+#define KESTO_ANY_INT : int
+#else
+#define KESTO_ANY_INT
+#endif
+
 // What became of a call on the library. The numbers never change; new ones may come.
-typedef enum kesto_status {
+typedef enum kesto_status KESTO_ANY_INT {
     KESTO_OK = 0,
     KESTO_INVALID_ARGUMENT = 1, // an argument that no call of this kind may have, such as a null message
     KESTO_OUT_OF_MEMORY = 2,
@@ -202,7 +209,7 @@ KESTO_API size_t kesto_message_size(const kesto_message* message);
 // ---- Answers ----
 
 // What was asked for; the numbers are those of the wire.
-typedef enum kesto_operation {
+typedef enum kesto_operation KESTO_ANY_INT {
     KESTO_OPERATION_CREATE_SESSION = 1,
     KESTO_OPERATION_SET_SERVICE_TYPE = 2,
     KESTO_OPERATION_GET_SERVICE_TYPE = 3,
@@ -249,7 +256,7 @@ typedef void (*kesto_release_callback)(void* user);
 
 typedef struct kesto_client kesto_client;
 
-typedef enum kesto_state {
+typedef enum kesto_state KESTO_ANY_INT {
     KESTO_STATE_CONNECTING = 0, // calls are taken and wait for the connection
     KESTO_STATE_CONNECTED = 1,
     KESTO_STATE_DISCONNECTED = 2, // calls are refused, until the next attempt if there is to be one
