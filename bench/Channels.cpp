@@ -1,10 +1,10 @@
 // Driver statistics: a snapshot of a thousand channels beside reading the same files in one loop, putting their change
 // into words, and publishing values beside writing a file for each of them.
 #include "Groups.h"
-#include "InProcessPlatform.h"
 #include "driver/KestoReportingDriverUtility.h"
-#include "platform/linux/ChannelDifference.h"
-#include "platform/linux/LinuxReportingChannels.h"
+#include "platform/linux/channels/ChannelDifference.h"
+#include "platform/linux/channels/LinuxReportingChannels.h"
+#include "support/InProcessPlatform.h"
 
 #include <array>
 #include <cstdlib>

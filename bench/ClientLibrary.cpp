@@ -2,8 +2,8 @@
 // there must not be any of. The peer is what a program would do without the library: writing as many bytes to a
 // socket itself.
 #include "Groups.h"
-#include "SampleMessage.h"
-#include "ServiceProcess.h"
+#include "support/SampleMessage.h"
+#include "support/ServiceProcess.h"
 
 #include <array>
 #include <csignal>

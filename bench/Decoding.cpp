@@ -1,10 +1,10 @@
 // The two steps of a message's road that are worth setting beside something by themselves: CBOR to values beside
 // libcbor, and keeping a payload beside a list of byte strings.
 #include "Groups.h"
-#include "InProcessPlatform.h"
-#include "SampleMessage.h"
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 #include "session/KestoReportingMessageStore.h"
+#include "support/InProcessPlatform.h"
+#include "support/SampleMessage.h"
 
 #include <cbor.h>
 #include <fmt/format.h>

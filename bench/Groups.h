@@ -1,8 +1,8 @@
 // The groups of measurements, each in a file of its own, in the order of the table.
 #pragma once
 
-#include "Harness.h"
-#include "Report.h"
+#include "support/Harness.h"
+#include "support/Report.h"
 
 namespace bench {
 

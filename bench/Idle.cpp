@@ -1,8 +1,8 @@
 // What the service costs when its clients have nothing to say. All rounds run side by side: they disturb each other
 // as little as they disturb anybody else.
-#include "DaemonPeer.h"
 #include "Groups.h"
-#include "ServiceProcess.h"
+#include "peers/DaemonPeer.h"
+#include "support/ServiceProcess.h"
 
 #include <deque>
 #include <fmt/format.h>

@@ -1,7 +1,7 @@
 // What a log statement costs that is not to be logged: one of the service's own, whose arguments would be dear to
 // make, beside syslog below its mask.
 #include "Groups.h"
-#include "InProcessPlatform.h"
+#include "support/InProcessPlatform.h"
 #include "utility/KestoReportingLogCategories.h"
 
 #include <fmt/ranges.h>

@@ -2,7 +2,7 @@
 // does one thing at a time, so they wait for as long as that takes; what the row shows is that it is once, and not
 // more.
 #include "Groups.h"
-#include "ServiceProcess.h"
+#include "support/ServiceProcess.h"
 
 #include <algorithm>
 #include <fmt/format.h>

@@ -2,9 +2,9 @@
 //
 // Found again and again, as the sessions of a client that is sending are; after a pause in which the processor's caches
 // were used for something else; and all of them in no order, which is as much as memory can be made to do.
-#include "CrowdedService.h"
 #include "Groups.h"
-#include "InProcessPlatform.h"
+#include "support/CrowdedService.h"
+#include "support/InProcessPlatform.h"
 
 #include <algorithm>
 #include <fmt/format.h>

@@ -1,7 +1,7 @@
 // A device-wide setting changes: every session of every client is told.
-#include "CrowdedService.h"
 #include "Groups.h"
-#include "InProcessPlatform.h"
+#include "support/CrowdedService.h"
+#include "support/InProcessPlatform.h"
 
 #include <fmt/format.h>
 

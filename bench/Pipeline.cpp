@@ -1,8 +1,8 @@
 // How many messages a second one client gets answered that does not wait for one answer before it sends the next
 // message.
-#include "BusPeer.h"
 #include "Groups.h"
-#include "ServiceProcess.h"
+#include "peers/BusPeer.h"
+#include "support/ServiceProcess.h"
 
 namespace bench {
 namespace {

@@ -3,9 +3,9 @@
 //
 // On most machines the greater part of the time is that of processors waking from their sleep, in which all contestants
 // are equal; so all is measured a second time on one processor, where that falls away.
-#include "BusPeer.h"
 #include "Groups.h"
-#include "ServiceProcess.h"
+#include "peers/BusPeer.h"
+#include "support/ServiceProcess.h"
 
 #include <fmt/format.h>
 

@@ -1,9 +1,9 @@
 // What recording costs a session in time, as it grows, and in memory.
 #include "Groups.h"
-#include "InProcessPlatform.h"
-#include "SampleMessage.h"
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 #include "session/KestoReportingSession.h"
+#include "support/InProcessPlatform.h"
+#include "support/SampleMessage.h"
 
 #include <fmt/format.h>
 #include <malloc.h>

@@ -1,11 +1,11 @@
 // What the end of a long session costs: finding what was played, the file, the summary event, and the memory that all
 // of it takes.
-#include "ChildProcess.h"
 #include "Groups.h"
-#include "InProcessPlatform.h"
-#include "SampleMessage.h"
-#include "platform/linux/LinuxFileSystem.h"
+#include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "session/KestoReportingSession.h"
+#include "support/ChildProcess.h"
+#include "support/InProcessPlatform.h"
+#include "support/SampleMessage.h"
 
 #include <cstdio>
 #include <fmt/format.h>

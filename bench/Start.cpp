@@ -1,8 +1,8 @@
 // How long it takes from starting the process until a client has its first answer: in an empty state directory, as
 // after installation.
-#include "DaemonPeer.h"
 #include "Groups.h"
-#include "ServiceProcess.h"
+#include "peers/DaemonPeer.h"
+#include "support/ServiceProcess.h"
 
 namespace bench {
 

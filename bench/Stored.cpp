@@ -2,8 +2,8 @@
 // journald is done when the last of its messages can be read back. In a burst, and for as long as it takes both to move
 // what they have written to its place; either may keep 4 GB.
 #include "Groups.h"
-#include "JournalPeer.h"
-#include "ServiceProcess.h"
+#include "peers/JournalPeer.h"
+#include "support/ServiceProcess.h"
 
 #include <fmt/format.h>
 

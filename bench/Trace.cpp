@@ -1,11 +1,11 @@
 // What a trace costs once it has ended: pairing its events, and everything from its stop to the results file.
-#include "ChildProcess.h"
 #include "Groups.h"
-#include "InProcessPlatform.h"
 #include "platform/ExchangedProviders.h"
-#include "platform/linux/LinuxFileSystem.h"
-#include "platform/linux/LinuxPerformanceWriter.h"
-#include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/diagnostics/LinuxFileSystem.h"
+#include "platform/linux/queues/LinuxWorkQueues.h"
+#include "platform/linux/trace/LinuxPerformanceWriter.h"
+#include "support/ChildProcess.h"
+#include "support/InProcessPlatform.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"
 

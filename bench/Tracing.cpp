@@ -1,14 +1,14 @@
 // The kernel's trace: what an event costs whoever emits it, and how fast the service takes the kernel's pages apart and
 // puts the events of all processors in order. Emitting is measured on the kernel itself; the peer is the bare write of
 // as many bytes.
-#include "ChildProcess.h"
 #include "Groups.h"
-#include "platform/linux/LinuxConnectionListener.h"
-#include "platform/linux/TraceMarker.h"
-#include "platform/linux/TraceMarkerAccess.h"
-#include "platform/linux/TraceMerger.h"
-#include "platform/linux/TracefsInstance.h"
-#include "platform/linux/TracefsMarkers.h"
+#include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/TraceMerger.h"
+#include "platform/linux/trace/TracefsInstance.h"
+#include "platform/linux/trace/TracefsMarkers.h"
+#include "support/ChildProcess.h"
 
 #include <cerrno>
 #include <chrono>

@@ -2,7 +2,7 @@
 // a table. It is a measurement and no test: a target that is missed is said, and the exit status is still 0.
 #include "Groups.h"
 
-#include "foundation/Json.h"
+#include "foundation/values/Json.h"
 
 #include <array>
 #include <cstdlib>

@@ -1,7 +1,7 @@
 // The CBOR decoder reads what any process on the machine may send. Whatever the bytes, it must end with a value
 // or an error, whatever it read before; and a value that it gave must survive its own encoding, byte for byte the
 // second time.
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 
 #include <cstdint>
 #include <cstdlib>

@@ -5,10 +5,10 @@
 // So is whom it names as its owner.
 //
 // The input is two files, one behind the other, cut in the middle by a zero byte, so that counters of two samples meet.
-#include "foundation/String.h"
-#include "platform/linux/ChannelDifference.h"
-#include "platform/linux/ChannelFile.h"
-#include "platform/linux/ChannelOwner.h"
+#include "foundation/values/String.h"
+#include "platform/linux/channels/ChannelDifference.h"
+#include "platform/linux/channels/ChannelFile.h"
+#include "platform/linux/channels/ChannelOwner.h"
 
 #include <algorithm>
 #include <cmath>

@@ -3,8 +3,8 @@
 // end, with the decoder of one connection remembering from one frame to the next.
 //
 // The first byte of the input chooses the cuts, the rest is the stream.
-#include "foundation/Cbor.h"
-#include "platform/linux/FrameReader.h"
+#include "foundation/cbor/Cbor.h"
+#include "platform/linux/connection/FrameReader.h"
 
 #include <algorithm>
 #include <cstdint>

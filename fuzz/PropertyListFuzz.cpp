@@ -1,7 +1,7 @@
 // Property lists are read from files that any client may name. Whatever the bytes, reading must end with a failure in
 // words or with a value within the limits; and that value must be one like any other, which survives its encoding.
-#include "foundation/Cbor.h"
-#include "foundation/PropertyList.h"
+#include "foundation/cbor/Cbor.h"
+#include "foundation/plist/PropertyList.h"
 
 #include <algorithm>
 #include <cstdint>

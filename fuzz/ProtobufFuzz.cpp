@@ -1,7 +1,7 @@
 // Bytes in the wire format of protocol buffers, from wherever. Reading must end, hand out nothing that lies outside the
 // input, and pass a group only whose content is well-formed by itself; and a record that was read must be written and
 // read again as the same.
-#include "foundation/ProtobufReader.h"
+#include "foundation/protobuf/ProtobufReader.h"
 #include "sinks/AudioIssueDetected.h"
 
 #include <cstdint>

@@ -4,7 +4,7 @@
 //
 // The input is one CBOR item.
 #include "client/KestoReportingServiceProtocolAdapter.h"
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 
 #include <cstdint>
 #include <cstdlib>

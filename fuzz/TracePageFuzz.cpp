@@ -4,7 +4,7 @@
 //
 // The input is pages, cut where a byte of the first one says; each is a copy of its own, so that reading beyond one is
 // noticed.
-#include "platform/linux/TraceMerger.h"
+#include "platform/linux/trace/TraceMerger.h"
 
 #include <algorithm>
 #include <cstdint>

@@ -1,7 +1,7 @@
 // What can fail is done before anything is exchanged; the exchange itself is one call of the kernel's.
 #include "Tracer.h"
 
-#include "platform/linux/TraceMarker.h"
+#include "platform/linux/trace/TraceMarker.h"
 
 #include <cerrno>
 #include <fcntl.h>

@@ -8,7 +8,7 @@
 #pragma once
 
 #include "kesto/trace.h"
-#include "platform/linux/FileDescriptor.h"
+#include "platform/linux/files/FileDescriptor.h"
 
 #include <array>
 #include <memory>

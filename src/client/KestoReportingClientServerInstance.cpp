@@ -2,7 +2,7 @@
 #include "client/KestoReportingClientServerInstance.h"
 
 #include "client/KestoReportingServerQueue.h"
-#include "foundation/Format.h"
+#include "foundation/text/Format.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 

@@ -3,7 +3,7 @@
 // With a list of reporters the sinks come first and the session last; without one, the session comes first.
 // Both orders are part of the contract.
 #include "client/KestoReportingClientServerInstance.h"
-#include "foundation/Format.h"
+#include "foundation/text/Format.h"
 #include "platform/BugCapture.h"
 #include "platform/Connection.h"
 #include "platform/Platform.h"

@@ -1,7 +1,7 @@
 // What a client object may ask of the one service object.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "session/KestoReportingSession.h"
 
 #include <cstdint>

@@ -4,7 +4,7 @@
 // in one case twice. Reporter IDs are chosen by the client; 0 stands for no session.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "utility/KestoReportingError.h"
 #include "utility/KestoReportingVocabulary.h"
 

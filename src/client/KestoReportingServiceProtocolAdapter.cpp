@@ -2,8 +2,8 @@
 // first that does not fit decides what is said about the call.
 #include "client/KestoReportingServiceProtocolAdapter.h"
 
-#include "foundation/Cbor.h"
-#include "foundation/Format.h"
+#include "foundation/cbor/Cbor.h"
+#include "foundation/text/Format.h"
 
 #include <array>
 #include <limits>

@@ -4,7 +4,7 @@
 // the number of sessions and the IDs that clients choose.
 #pragma once
 
-#include "foundation/IntegerHash.h"
+#include "foundation/values/IntegerHash.h"
 #include "session/KestoReportingSession.h"
 
 #include <cstdint>

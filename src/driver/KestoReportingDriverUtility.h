@@ -3,7 +3,7 @@
 #pragma once
 
 #include "driver/KestoReportingIOChannelSubscription.h"
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "session/KestoReportingDriverSnapShot.h"
 #include "session/KestoReportingSession.h"
 

@@ -1,7 +1,7 @@
 // How the drivers' channels changed over a session, put into words: one entry a channel, in a dictionary for
 // each kind of channel.
 #include "driver/KestoReportingDriverUtility.h"
-#include "foundation/Format.h"
+#include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
 #include "utility/KestoReportingUtility.h"

@@ -1,7 +1,7 @@
 // The analytics-event service: keeps named events whose names somebody wants.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 
 #include <functional>
 #include <string>

@@ -1,7 +1,7 @@
 // The automatic bug-capture service: takes a diagnostic snapshot of the device under a signature.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 
 #include <cstdint>
 #include <functional>

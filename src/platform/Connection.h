@@ -7,7 +7,7 @@
 // delivered before that; what it sent behind a call that breaks the protocol is not.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 
 #include <cstdint>
 #include <expected>

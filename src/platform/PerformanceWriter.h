@@ -1,7 +1,7 @@
 // The performance-data writer: one file of named measurements.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 
 #include <cstdint>
 #include <filesystem>

@@ -1,7 +1,7 @@
 // The preferences store: values by domain and key, changed by the device's owner while the service runs.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 
 #include <optional>
 #include <string_view>

@@ -5,7 +5,7 @@
 // which has the ID; so the clients of an ID are kept in that order.
 #pragma once
 
-#include "foundation/IntegerHash.h"
+#include "foundation/values/IntegerHash.h"
 
 #include <cstdint>
 #include <map>

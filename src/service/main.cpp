@@ -1,9 +1,9 @@
 // kestod: puts the service object on the Linux platform and gives the main thread to the listener, for the life of
 // the process. There is no command line; the launch configuration is all in the environment.
 #include "platform/linux/LaunchConfiguration.h"
-#include "platform/linux/LinuxConnectionListener.h"
 #include "platform/linux/LinuxPlatform.h"
-#include "platform/linux/ServiceManager.h"
+#include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/process/ServiceManager.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "tracing/TraceRunner.h"
 #include "utility/KestoReportingLogCategories.h"

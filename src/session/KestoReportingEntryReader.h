@@ -6,7 +6,7 @@
 // what it has derived already.
 #pragma once
 
-#include "foundation/CborView.h"
+#include "foundation/cbor/CborView.h"
 #include "session/KestoReportingMessageStore.h"
 
 #include <algorithm>

@@ -1,7 +1,7 @@
 // How payloads are laid out behind each other, who pays for them, and what tells a repetition.
 #include "session/KestoReportingMessageStore.h"
 
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <algorithm>

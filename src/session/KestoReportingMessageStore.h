@@ -6,8 +6,8 @@
 // decides on the next message is kept ready: per kind, the count and the payload accepted last.
 #pragma once
 
-#include "foundation/CborView.h"
-#include "foundation/Value.h"
+#include "foundation/cbor/CborView.h"
+#include "foundation/values/Value.h"
 #include "session/KestoReportingStorageBudget.h"
 #include "utility/KestoReportingVocabulary.h"
 

@@ -1,8 +1,8 @@
 // The session's life: creation, configuration, start, stop and teardown.
 #include "session/KestoReportingSession.h"
 
-#include "foundation/Cbor.h"
-#include "foundation/Format.h"
+#include "foundation/cbor/Cbor.h"
+#include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
 #include "tracing/TraceParams.h"

@@ -6,7 +6,7 @@
 #pragma once
 
 #include "foundation/Mutex.h"
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "session/KestoReportingDriverSnapShot.h"
 #include "session/KestoReportingMessageStore.h"
 #include "sinks/KestoReportingSinkSession.h"

@@ -1,10 +1,10 @@
 // The session's summary: every value that each key took, in one event, and on internal builds the whole message
 // store as a file that diagnostic tools read.
 #define KESTO_LOG_NAME "KestoReportingSession"
-#include "foundation/Format.h"
-#include "foundation/LocalTime.h"
-#include "foundation/PrettyJsonWriter.h"
-#include "foundation/StringBuilder.h"
+#include "foundation/text/Format.h"
+#include "foundation/text/LocalTime.h"
+#include "foundation/text/PrettyJsonWriter.h"
+#include "foundation/text/StringBuilder.h"
 #include "platform/Platform.h"
 #include "session/KestoReportingEntryReader.h"
 #include "session/KestoReportingSession.h"

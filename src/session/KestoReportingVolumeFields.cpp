@@ -1,7 +1,7 @@
 // Finding the fields among the entries of a message.
 #include "session/KestoReportingVolumeFields.h"
 
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 #include "utility/KestoReportingUtility.h"
 
 namespace {

@@ -4,7 +4,7 @@
 // would cost more than the analysis.
 #pragma once
 
-#include "foundation/CborView.h"
+#include "foundation/cbor/CborView.h"
 #include "session/KestoReportingEntryReader.h"
 #include "session/KestoReportingMessageStore.h"
 

@@ -4,7 +4,7 @@
 // service sends any.
 #pragma once
 
-#include "foundation/ProtobufMessage.h"
+#include "foundation/protobuf/ProtobufMessage.h"
 
 #include <cstddef>
 #include <cstdint>

@@ -1,7 +1,7 @@
 // Both events of a message share one payload, which is built when the first of them needs it.
 #include "sinks/KestoReportingFennicBridge.h"
 
-#include "foundation/Format.h"
+#include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "utility/KestoReportingUtility.h"
 

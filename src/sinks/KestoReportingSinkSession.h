@@ -1,7 +1,7 @@
 // What a sink sees of a session: enough to name an event and to say who played, and nothing more.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "utility/KestoReportingVocabulary.h"
 
 // Any thread: a payload may be built after the session's own work went on.

@@ -5,8 +5,8 @@
 // which names no end, ends with the event of the interval before it.
 #include "tracing/TraceParamsParser.h"
 
-#include "foundation/Format.h"
-#include "foundation/PropertyList.h"
+#include "foundation/plist/PropertyList.h"
+#include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "utility/KestoReportingLogCategories.h"
 

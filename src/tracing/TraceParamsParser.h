@@ -4,7 +4,7 @@
 // wrong shape. Nothing of that ends the reading: what is wrong is logged and counts as empty, and the rest is read.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "tracing/TraceParams.h"
 
 #include <cstddef>

@@ -1,7 +1,7 @@
 // A trace's way: set up, started, ended, completed.
 #include "tracing/TraceRunner.h"
 
-#include "foundation/Format.h"
+#include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "tracing/TraceParams.h"
 #include "utility/KestoReportingLogCategories.h"

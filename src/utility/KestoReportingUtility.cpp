@@ -1,7 +1,7 @@
 // Small functions on the platform's clock, process table and device properties, and on payloads.
 #include "utility/KestoReportingUtility.h"
 
-#include "foundation/NumberFormatter.h"
+#include "foundation/text/NumberFormatter.h"
 #include "platform/Platform.h"
 
 #include <algorithm>

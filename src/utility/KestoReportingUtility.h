@@ -5,7 +5,7 @@
 #pragma once
 
 #include "foundation/Mutex.h"
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "platform/ProcessTable.h"
 #include "utility/KestoReportingLogCategories.h"
 #include "utility/KestoReportingVocabulary.h"

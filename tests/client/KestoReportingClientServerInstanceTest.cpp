@@ -1,7 +1,7 @@
 // A client's operations on sessions, called through the protocol: what is answered, what is said in which order, and
 // whose sessions each of them reaches.
 #include "client/KestoReportingClientServerInstance.h"
-#include "platform/linux/FrameReader.h"
+#include "platform/linux/connection/FrameReader.h"
 #include "support/ServiceHarness.h"
 
 #include <cstdlib>

@@ -1,7 +1,7 @@
 // What is on the wire, call by call: which operation a frame means, what is refused and in which words, and how
 // answers look.
 #include "client/KestoReportingServiceProtocolAdapter.h"
-#include "support/FakeConnection.h"
+#include "support/fakes/FakeConnection.h"
 
 #include <gmock/gmock.h>
 #include <limits>

@@ -2,7 +2,7 @@
 // everything that files may do in between.
 #include "driver/KestoReportingDriverUtility.h"
 #include "platform/ExchangedProviders.h"
-#include "platform/linux/LinuxReportingChannels.h"
+#include "platform/linux/channels/LinuxReportingChannels.h"
 #include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
 

@@ -1,7 +1,7 @@
 // A real service process on a private socket, in directories of its own.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 #include "support/TemporaryDirectory.h"
 
 #include <chrono>

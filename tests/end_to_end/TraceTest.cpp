@@ -2,8 +2,8 @@
 // says the same.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
-#include "kesto/TraceResultsFile.h"
-#include "platform/linux/RealTracefs.h"
+#include "kesto/trace/TraceResultsFile.h"
+#include "platform/linux/trace/RealTracefs.h"
 
 #include <algorithm>
 #include <gmock/gmock.h>

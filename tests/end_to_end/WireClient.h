@@ -1,9 +1,9 @@
 // A client that speaks in frames and, where a test wants it, in bytes that are none.
 #pragma once
 
-#include "foundation/Cbor.h"
-#include "foundation/Value.h"
-#include "platform/linux/FileDescriptor.h"
+#include "foundation/cbor/Cbor.h"
+#include "foundation/values/Value.h"
+#include "platform/linux/files/FileDescriptor.h"
 
 #include <cstdint>
 #include <filesystem>

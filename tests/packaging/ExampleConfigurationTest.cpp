@@ -1,6 +1,6 @@
 // The example configuration files are what they say they are: right, and saying nothing but the defaults.
-#include "platform/linux/AnalyticsConfiguration.h"
-#include "platform/linux/TomlFile.h"
+#include "platform/linux/settings/TomlFile.h"
+#include "platform/linux/store/AnalyticsConfiguration.h"
 
 #include <fstream>
 #include <gmock/gmock.h>

@@ -2,10 +2,10 @@
 // told, and answers as the test wants.
 #pragma once
 
-#include "foundation/Cbor.h"
 #include "foundation/Mutex.h"
-#include "platform/linux/FileDescriptor.h"
-#include "platform/linux/FrameReader.h"
+#include "foundation/cbor/Cbor.h"
+#include "platform/linux/connection/FrameReader.h"
+#include "platform/linux/files/FileDescriptor.h"
 
 #include <chrono>
 #include <cstdint>

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "foundation/Mutex.h"
-#include "platform/linux/FileDescriptor.h"
+#include "platform/linux/files/FileDescriptor.h"
 
 #include <optional>
 #include <string>

@@ -1,8 +1,8 @@
 // Emitting trace events: what a program does with a tracer while its client connects, is handed the marker, and loses
 // its connection again. The marker is a pipe, the page the service's own.
 #include "kesto/trace.hpp"
-#include "platform/linux/TraceMarker.h"
-#include "platform/linux/TraceMarkerAccess.h"
+#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/TraceMarkerAccess.h"
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"

@@ -1,7 +1,7 @@
 // The message store against its definition: a list of identifiers and payloads in which the last message of a kind
 // is found by walking back from the end. And what hostile messages cost it.
 #include "session/KestoReportingMessageStore.h"
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>

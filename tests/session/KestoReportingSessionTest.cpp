@@ -1,6 +1,6 @@
 // A session's life: what it is made with, how its configuration grows, and how a run begins and ends.
 #include "session/KestoReportingSession.h"
-#include "foundation/Cbor.h"
+#include "foundation/cbor/Cbor.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>

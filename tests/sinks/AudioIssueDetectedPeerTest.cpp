@@ -3,8 +3,8 @@
 #include "sinks/AudioIssueDetected.h"
 
 #include "AudioIssueDetected.pb.h"
-#include "foundation/GeneratedValues.h"
 #include "foundation/GuardedBytes.h"
+#include "foundation/values/GeneratedValues.h"
 
 #include <google/protobuf/stubs/logging.h>
 #include <google/protobuf/text_format.h>

@@ -1,7 +1,7 @@
 // JSON read by a library that the service does not read with: what it makes of a text is what others make of it.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 
 #include <optional>
 #include <rapidjson/memorystream.h>

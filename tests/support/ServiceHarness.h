@@ -9,8 +9,8 @@
 #include "client/KestoReportingClientServerInstance.h"
 #include "client/KestoReportingServerQueue.h"
 #include "service/KestoReportingServiceDelegate.h"
-#include "support/FakeConnection.h"
 #include "support/TestPlatform.h"
+#include "support/fakes/FakeConnection.h"
 
 #include <cstdint>
 #include <functional>

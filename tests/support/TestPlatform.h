@@ -2,17 +2,17 @@
 #pragma once
 
 #include "platform/Platform.h"
-#include "support/FakeAnalytics.h"
-#include "support/FakeBugCapture.h"
-#include "support/FakeClock.h"
-#include "support/FakeFiles.h"
-#include "support/FakeKernelTrace.h"
-#include "support/FakeLog.h"
-#include "support/FakeNotifications.h"
-#include "support/FakeReportingChannels.h"
-#include "support/FakeSettings.h"
-#include "support/FakeTraceMarkers.h"
-#include "support/FakeWorkQueues.h"
+#include "support/fakes/FakeAnalytics.h"
+#include "support/fakes/FakeBugCapture.h"
+#include "support/fakes/FakeClock.h"
+#include "support/fakes/FakeFiles.h"
+#include "support/fakes/FakeKernelTrace.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeNotifications.h"
+#include "support/fakes/FakeReportingChannels.h"
+#include "support/fakes/FakeSettings.h"
+#include "support/fakes/FakeTraceMarkers.h"
+#include "support/fakes/FakeWorkQueues.h"
 
 namespace support {
 

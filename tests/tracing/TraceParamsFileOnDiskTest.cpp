@@ -1,8 +1,8 @@
 // Whatever a client may have put at the path that it names: reading ends at once, with an empty record and a line.
 #include "tracing/TraceParamsParser.h"
 
-#include "foundation/PropertyListWriter.h"
-#include "platform/linux/LinuxFileSystem.h"
+#include "foundation/plist/PropertyListWriter.h"
+#include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
 

@@ -1,7 +1,7 @@
 // Trace-parameters files, good and bad, in both encodings: what is read of them, and what is said.
 #include "tracing/TraceParamsParser.h"
 
-#include "foundation/PropertyListWriter.h"
+#include "foundation/plist/PropertyListWriter.h"
 #include "support/TestPlatform.h"
 
 #include <filesystem>

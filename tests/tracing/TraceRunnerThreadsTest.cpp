@@ -2,7 +2,7 @@
 // results hold every interval that was delivered before the end, and nothing is touched by two threads. What two
 // threads must not do shows under the thread sanitizer.
 #include "platform/ExchangedProviders.h"
-#include "platform/linux/LinuxWorkQueues.h"
+#include "platform/linux/queues/LinuxWorkQueues.h"
 #include "support/TestPlatform.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"

@@ -1,7 +1,7 @@
 // A trace and what it measures: arguments of single events, results by name, and the events in memory.
 #include "tracing/Trace.h"
-#include "support/FakeKernelTrace.h"
 #include "support/TestPlatform.h"
+#include "support/fakes/FakeKernelTrace.h"
 #include "tracing/TraceEvents.h"
 #include "tracing/TraceEventsOf.h"
 #include "tracing/TracePoint.h"

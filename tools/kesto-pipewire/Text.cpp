@@ -2,7 +2,7 @@
 // foreign.
 #include "kesto-pipewire/Text.h"
 
-#include "foundation/String.h"
+#include "foundation/values/String.h"
 
 #include <algorithm>
 

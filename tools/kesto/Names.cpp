@@ -1,5 +1,5 @@
 // The vocabulary has functions from number to name only: here every number that has a name of its own is tried.
-#include "Names.h"
+#include "kesto/Names.h"
 
 #include <algorithm>
 #include <array>

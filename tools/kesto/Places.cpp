@@ -1,5 +1,5 @@
 // One rule for all three directories; they differ in their names only.
-#include "Places.h"
+#include "kesto/Places.h"
 
 #include <cstdlib>
 #include <initializer_list>

@@ -1,7 +1,7 @@
 // Characters are told apart by the first bytes of their UTF-8, whether or not the rest is in order.
-#include "Terminal.h"
+#include "kesto/Terminal.h"
 
-#include "foundation/Json.h"
+#include "foundation/values/Json.h"
 
 #include <algorithm>
 #include <cstdlib>

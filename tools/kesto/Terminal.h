@@ -2,7 +2,7 @@
 // character counts as one column.
 #pragma once
 
-#include "foundation/Value.h"
+#include "foundation/values/Value.h"
 
 #include <string>
 #include <string_view>

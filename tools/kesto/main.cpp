@@ -1,5 +1,5 @@
 // kesto: how a person talks to the service and reads what it found out.
-#include "Commands.h"
+#include "kesto/Commands.h"
 
 #include <CLI/Error.hpp>
 #include <cstdio>

@@ -2,8 +2,8 @@
 // them, so that a unit file sets everything.
 #pragma once
 
-#include "platform/linux/ListeningSocket.h"
-#include "platform/linux/LogThresholds.h"
+#include "platform/linux/connection/ListeningSocket.h"
+#include "platform/linux/log/LogThresholds.h"
 
 #include <expected>
 #include <filesystem>

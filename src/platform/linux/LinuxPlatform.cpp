@@ -2,7 +2,7 @@
 // happens at the end of a turn.
 #include "platform/linux/LinuxPlatform.h"
 
-#include "platform/linux/Outbox.h"
+#include "platform/linux/connection/Outbox.h"
 
 namespace platform {
 namespace {

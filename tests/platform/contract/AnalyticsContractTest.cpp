@@ -1,13 +1,13 @@
 // The contract of platform/Analytics.h: events whose names somebody wants are kept, in order, with payloads that are
 // built once; of the others nothing remains.
 #include "platform/contract/Contract.h"
-#include "platform/linux/AnalyticsStore.h"
-#include "platform/linux/LinuxClock.h"
-#include "platform/linux/StoreReader.h"
-#include "support/FakeAnalytics.h"
-#include "support/FakeLog.h"
+#include "platform/linux/process/LinuxClock.h"
+#include "platform/linux/store/AnalyticsStore.h"
+#include "platform/linux/store/StoreReader.h"
 #include "support/ParseJson.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeAnalytics.h"
+#include "support/fakes/FakeLog.h"
 
 #include <atomic>
 #include <gmock/gmock.h>

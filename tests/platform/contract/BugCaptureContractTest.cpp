@@ -2,12 +2,12 @@
 // the answer comes. It holds on a device without the service, too: there, nothing is kept.
 #include "platform/Absent.h"
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxBugCapture.h"
-#include "platform/linux/LinuxLog.h"
-#include "support/FakeBugCapture.h"
+#include "platform/linux/bugs/LinuxBugCapture.h"
+#include "platform/linux/log/LinuxLog.h"
 #include "support/ParseJson.h"
 #include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
+#include "support/fakes/FakeBugCapture.h"
 
 #include <gmock/gmock.h>
 #include <optional>

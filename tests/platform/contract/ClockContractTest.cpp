@@ -1,7 +1,7 @@
 // The contract of platform/Clock.h: a time of day, and an uptime that only ever grows.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxClock.h"
-#include "support/FakeClock.h"
+#include "platform/linux/process/LinuxClock.h"
+#include "support/fakes/FakeClock.h"
 
 namespace contract {
 namespace {

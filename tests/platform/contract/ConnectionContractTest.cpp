@@ -1,13 +1,13 @@
 // The contract of platform/Connection.h: the order of calls and ends, who is held until when, when answers leave, and
 // what becomes of those that come too late.
 #include "platform/contract/Contract.h"
-#include "platform/linux/ConnectionClient.h"
-#include "platform/linux/LinuxConnectionListener.h"
-#include "platform/linux/LinuxWorkQueues.h"
-#include "platform/linux/Outbox.h"
-#include "support/FakeConnection.h"
-#include "support/FakeWorkQueues.h"
+#include "platform/linux/connection/ConnectionClient.h"
+#include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/connection/Outbox.h"
+#include "platform/linux/queues/LinuxWorkQueues.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeConnection.h"
+#include "support/fakes/FakeWorkQueues.h"
 
 #include <atomic>
 #include <gmock/gmock.h>

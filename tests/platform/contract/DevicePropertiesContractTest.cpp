@@ -1,9 +1,9 @@
 // The contract of platform/DeviceProperties.h: a property is true, false, or not there.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxDeviceProperties.h"
-#include "support/FakeLog.h"
-#include "support/FakeSettings.h"
+#include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeSettings.h"
 
 namespace contract {
 namespace {

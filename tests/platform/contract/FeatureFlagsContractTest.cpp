@@ -1,9 +1,9 @@
 // The contract of platform/FeatureFlags.h: a flag is on when its owner has switched it on, and only then.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxFeatureFlags.h"
-#include "support/FakeLog.h"
-#include "support/FakeSettings.h"
+#include "platform/linux/settings/LinuxFeatureFlags.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeSettings.h"
 
 namespace contract {
 namespace {

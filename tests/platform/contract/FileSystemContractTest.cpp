@@ -1,13 +1,13 @@
 // The contract of platform/FileSystem.h: folders with their permissions, files that are there whole or not at all, and
 // what is said of those that cannot be written or read.
 #include "platform/contract/Contract.h"
-#include "platform/linux/FolderKeeper.h"
-#include "platform/linux/LinuxFileSystem.h"
-#include "support/FakeClock.h"
-#include "support/FakeFiles.h"
-#include "support/FakeLog.h"
-#include "support/FakeWorkQueues.h"
+#include "platform/linux/diagnostics/FolderKeeper.h"
+#include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeClock.h"
+#include "support/fakes/FakeFiles.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeWorkQueues.h"
 
 #include <gmock/gmock.h>
 #include <optional>

@@ -3,13 +3,13 @@
 // The provider of Linux is met twice: on a directory that looks like tracefs, everywhere, and on the kernel itself
 // where this machine lets a test have it.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxWorkQueues.h"
-#include "platform/linux/RealTracefs.h"
-#include "platform/linux/TracePages.h"
-#include "platform/linux/TracefsKernelTrace.h"
-#include "support/FakeKernelTrace.h"
-#include "support/FakeLog.h"
-#include "support/FakeWorkQueues.h"
+#include "platform/linux/queues/LinuxWorkQueues.h"
+#include "platform/linux/trace/RealTracefs.h"
+#include "platform/linux/trace/TracePages.h"
+#include "platform/linux/trace/TracefsKernelTrace.h"
+#include "support/fakes/FakeKernelTrace.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeWorkQueues.h"
 
 #include <algorithm>
 #include <gmock/gmock.h>

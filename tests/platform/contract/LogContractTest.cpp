@@ -1,10 +1,10 @@
 // The contract of platform/Log.h, of the log itself: a threshold for each category, and lines that say what they were
 // given, from any thread.
 #include "platform/contract/Contract.h"
-#include "platform/linux/FileDescriptor.h"
-#include "platform/linux/LinuxLog.h"
-#include "support/FakeLog.h"
+#include "platform/linux/files/FileDescriptor.h"
+#include "platform/linux/log/LinuxLog.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
 
 #include <array>
 #include <atomic>

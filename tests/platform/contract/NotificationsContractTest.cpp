@@ -1,12 +1,12 @@
 // The contract of platform/Notifications.h: names that are posted, whose handlers run on their queues and find the
 // state that was posted.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxNotifications.h"
-#include "platform/linux/LinuxWorkQueues.h"
-#include "support/FakeLog.h"
-#include "support/FakeNotifications.h"
-#include "support/FakeWorkQueues.h"
+#include "platform/linux/queues/LinuxWorkQueues.h"
+#include "platform/linux/settings/LinuxNotifications.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeNotifications.h"
+#include "support/fakes/FakeWorkQueues.h"
 
 #include <optional>
 #include <vector>

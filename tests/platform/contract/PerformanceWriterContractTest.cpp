@@ -1,11 +1,11 @@
 // The contract of platform/PerformanceWriter.h: what a file holds when it is closed, and where none can be opened.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxFileSystem.h"
-#include "platform/linux/LinuxPerformanceWriter.h"
-#include "support/FakeFiles.h"
-#include "support/FakeLog.h"
+#include "platform/linux/diagnostics/LinuxFileSystem.h"
+#include "platform/linux/trace/LinuxPerformanceWriter.h"
 #include "support/ParseJson.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeFiles.h"
+#include "support/fakes/FakeLog.h"
 
 #include <gmock/gmock.h>
 #include <limits>

@@ -1,9 +1,9 @@
 // The contract of platform/Preferences.h: values by domain and key, as they are stored now.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxPreferences.h"
-#include "support/FakeLog.h"
-#include "support/FakeSettings.h"
+#include "platform/linux/settings/LinuxPreferences.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeSettings.h"
 
 #include <map>
 #include <vector>

@@ -1,8 +1,8 @@
 // The contract of platform/ProcessTable.h: processes by number, under the names that the kernel has of them.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxProcessTable.h"
 #include "platform/linux/NamedProcess.h"
-#include "support/FakeSettings.h"
+#include "platform/linux/process/LinuxProcessTable.h"
+#include "support/fakes/FakeSettings.h"
 
 #include <limits>
 #include <map>

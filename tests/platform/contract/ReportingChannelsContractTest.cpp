@@ -1,9 +1,9 @@
 // The contract of platform/ReportingChannels.h: what is found, what a sample holds, and what the difference of two is.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxReportingChannels.h"
-#include "support/FakeLog.h"
-#include "support/FakeReportingChannels.h"
+#include "platform/linux/channels/LinuxReportingChannels.h"
 #include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeReportingChannels.h"
 
 #include <fmt/format.h>
 #include <gmock/gmock.h>

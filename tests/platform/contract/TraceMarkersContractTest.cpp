@@ -1,10 +1,10 @@
 // The contract of platform/TraceMarkers.h: each marker is one event of the trace, and costs nothing where nobody
 // traces.
 #include "platform/contract/Contract.h"
-#include "platform/linux/FileDescriptor.h"
-#include "platform/linux/TraceMarker.h"
-#include "platform/linux/TracefsMarkers.h"
-#include "support/FakeTraceMarkers.h"
+#include "platform/linux/files/FileDescriptor.h"
+#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/TracefsMarkers.h"
+#include "support/fakes/FakeTraceMarkers.h"
 
 #include <algorithm>
 #include <fcntl.h>

@@ -1,8 +1,8 @@
 // The contract of platform/WorkQueue.h: the order of items, who runs them when, and what waits for what.
 #include "platform/contract/Contract.h"
-#include "platform/linux/LinuxWorkQueues.h"
 #include "platform/linux/NoThreads.h"
-#include "support/FakeWorkQueues.h"
+#include "platform/linux/queues/LinuxWorkQueues.h"
+#include "support/fakes/FakeWorkQueues.h"
 
 #include <gmock/gmock.h>
 #include <optional>

@@ -1,7 +1,7 @@
 // Every way to start the service wrongly has a line of its own; and what passes between it and its manager.
 #include "platform/linux/LaunchConfiguration.h"
 
-#include "platform/linux/ServiceManager.h"
+#include "platform/linux/process/ServiceManager.h"
 #include "support/TemporaryDirectory.h"
 
 #include <array>

@@ -1,7 +1,7 @@
 // The providers together: each is made from the launch configuration, and what ties them to each other works.
 #include "platform/linux/LinuxPlatform.h"
 
-#include "platform/linux/StoreReader.h"
+#include "platform/linux/store/StoreReader.h"
 #include "support/TemporaryDirectory.h"
 
 #include <future>

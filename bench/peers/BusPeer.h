@@ -1,0 +1,41 @@
+// The peer that comes closest: the same call over sd-bus, peer to peer, the message as a{sv}, then category, type and
+// the array of reporters. Its server unpacks all of it, as a service must, and answers.
+#pragma once
+
+#include "support/ChildProcess.h"
+#include "support/RawClient.h"
+
+#include <cstdint>
+#include <memory>
+#include <systemd/sd-bus.h>
+
+namespace bench {
+
+struct CloseBus {
+    void operator()(sd_bus* bus) const { ::sd_bus_close_unref(bus); }
+};
+using Bus = std::unique_ptr<sd_bus, CloseBus>;
+
+// The server's process, for one client at the other end of the socket.
+[[nodiscard]] ChildProcess runBusServer(const SocketPair& sockets);
+
+// A client that uses sd-bus, too.
+class BusClient {
+public:
+    explicit BusClient(platform::FileDescriptor socket);
+    void roundTrip();
+    // Sends so many calls, of which at most as many wait for an answer as `RawClient` allows.
+    void pipeline(std::size_t count);
+
+private:
+    Bus bus_;
+    std::uint32_t number_;
+};
+
+// The raw client, with a request that sd-bus encoded.
+[[nodiscard]] RawClient makeRawBusClient(platform::FileDescriptor socket);
+
+// Connects to a message bus that listens at the path, as one of its clients; null when nobody answers.
+[[nodiscard]] Bus connectToBus(const std::filesystem::path& path);
+
+} // namespace bench

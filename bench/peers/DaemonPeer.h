@@ -1,0 +1,24 @@
+// dbus-daemon as a peer for what a service costs when nothing happens, and for how quickly it is there.
+#pragma once
+
+#include "peers/BusPeer.h"
+#include "support/ChildProcess.h"
+
+#include <filesystem>
+
+namespace bench {
+
+class DaemonPeer {
+public:
+    [[nodiscard]] static bool isInstalled();
+    DaemonPeer();
+    [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
+    // Waits until it answers a client.
+    [[nodiscard]] Bus connect() const;
+
+private:
+    TemporaryDirectory directory_;
+    ChildProcess process_;
+};
+
+} // namespace bench

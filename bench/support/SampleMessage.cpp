@@ -1,0 +1,23 @@
+// Each kind of value that players send is in it.
+#include "support/SampleMessage.h"
+
+namespace bench {
+
+foundation::Dictionary sampleMessage(std::uint32_t number)
+{
+    static const foundation::Dictionary message{
+        {"session_output_running", true},
+        {"session_selected_format", "lpcm, 48 kHz, 24 bit"},
+        {"mChannelsPerFrame", 2},
+        {"active_devices", "Built-in Speakers"},
+        {"PomoSessionVolume", 0.8125},
+        {"kestoreporting_timestamp", 1'767'225'600.25},
+        {"systemuptime_sec", 86'523},
+        {"spatializationEnabled", false},
+        {"ringerstate", true},
+        {"frames_rendered", numberMark},
+    };
+    return number == numberMark ? message : message.with("frames_rendered", number);
+}
+
+} // namespace bench

@@ -1,0 +1,44 @@
+// The real service, in directories of its own, and what its clients send.
+#pragma once
+
+#include "foundation/values/Value.h"
+#include "support/ChildProcess.h"
+#include "support/Harness.h"
+#include "support/RawClient.h"
+
+#include <cstdint>
+#include <string>
+#include <string_view>
+
+namespace bench {
+
+class ServiceProcess {
+public:
+    enum class Build : std::uint8_t { Customer, Internal };
+
+    // `analytics` is what analytics.toml says. Returns before the service listens.
+    explicit ServiceProcess(const Options& options, std::string_view analytics = "used = []",
+                            Build build = Build::Customer);
+
+    [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
+    [[nodiscard]] std::filesystem::path socketPath() const;
+    // Waits until the service listens.
+    [[nodiscard]] platform::FileDescriptor connect() const;
+    // A connection with the sample session on it, started.
+    [[nodiscard]] platform::FileDescriptor connectWithSession() const;
+    // A client that sends the sample message to it.
+    [[nodiscard]] RawClient makeClient() const;
+
+private:
+    TemporaryDirectory directory_;
+    ChildProcess process_;
+};
+
+// A frame with its head.
+[[nodiscard]] std::string frame(const foundation::Array& call);
+// The frame of the sample message, for pre-encoded use. The call's number is the running number, too.
+[[nodiscard]] std::string sampleFrame();
+// The size of its answer's frame.
+constexpr std::size_t sampleAnswerSize = 11;
+
+} // namespace bench

@@ -1,0 +1,266 @@
+// One loop: answers first, then what callers gave, then sleep.
+#include "calls/Courier.h"
+
+#include <algorithm>
+#include <array>
+#include <limits>
+#include <memory>
+#include <new>
+#include <poll.h>
+
+namespace libkesto {
+namespace {
+
+constexpr Courier::Milliseconds forever{-1}; // as poll has it
+constexpr std::uint64_t traceRequest = 0; // its number; those of calls begin with 1
+
+} // namespace
+
+Courier::Courier(Settings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters)
+    : settings_(std::move(settings)),
+      mailbox_(mailbox),
+      flushes_(flushes),
+      counters_(counters),
+      connection_(counters),
+      calls_(counters),
+      retryPause_(settings_.firstRetry)
+{
+}
+
+Courier::~Courier()
+{
+    loseWaitingCalls(KESTO_CLOSED);
+}
+
+void Courier::stop() noexcept
+{
+    isStopping_.store(true);
+    mailbox_.ring();
+}
+
+void Courier::run() noexcept
+{
+    while (!isStopping_.load()) {
+        try {
+            step();
+        } catch (const std::bad_alloc&) { // the call at fault is still in the mailbox, or known to be unanswered
+            disconnect({KESTO_OUT_OF_MEMORY});
+        }
+    }
+    close();
+    state_.store(KESTO_STATE_CLOSED);
+    calls_.endAll(KESTO_CLOSED);
+    loseWaitingCalls(KESTO_CLOSED);
+    changeState(KESTO_STATE_CLOSED);
+    flushes_.close();
+}
+
+void Courier::step()
+{
+    switch (state_.load()) {
+    case KESTO_STATE_CONNECTING: return connect();
+    case KESTO_STATE_CONNECTED: return exchange();
+    default: return pauseBeforeRetry();
+    }
+}
+
+void Courier::connect()
+{
+    if (const auto opened = connection_.open(settings_.paths); !opened)
+        return disconnect(opened.error());
+    ++counters_.connections;
+    retryPause_ = settings_.firstRetry;
+    if (settings_.tracer)
+        connection_.appendTraceRequest(traceRequest);
+    changeState(KESTO_STATE_CONNECTED);
+}
+
+void Courier::close() noexcept
+{
+    connection_.close();
+    if (settings_.tracer)
+        settings_.tracer->detach(); // whatever a service said that is gone
+}
+
+void Courier::disconnect(ConnectionFailure failure)
+{
+    close();
+    retryAt_.reset();
+    if (settings_.reconnect) {
+        retryAt_ = Clock::now() + retryPause_;
+        retryPause_ = std::min(retryPause_ * 2, settings_.longestRetry);
+    }
+    state_.store(KESTO_STATE_DISCONNECTED); // from here on calls are refused
+    startedReporters_.clear();
+    calls_.endAll(KESTO_CONNECTION_LOST);
+    loseWaitingCalls(KESTO_CONNECTION_LOST);
+    flushes_.endAll(KESTO_CONNECTION_LOST);
+    changeState(KESTO_STATE_DISCONNECTED, failure);
+}
+
+void Courier::pauseBeforeRetry()
+{
+    loseWaitingCalls(KESTO_CONNECTION_LOST); // what was given in the moment of the change
+    flushes_.endAll(KESTO_NOT_CONNECTED);
+    static_cast<void>(wait());
+    if (retryAt_ && Clock::now() >= *retryAt_)
+        changeState(KESTO_STATE_CONNECTING);
+}
+
+void Courier::exchange()
+{
+    takeCalls();
+    if (const auto sent = connection_.send(); !sent) {
+        while (receive().value_or(0) > 0) { } // what was answered before the service went
+        return disconnect(sent.error());
+    }
+    flushes_.serve(mailbox_.readPosition(), lastCall_, calls_);
+    if (!wait())
+        return;
+    if (const auto received = receive(); !received)
+        disconnect(received.error());
+}
+
+std::expected<std::size_t, ConnectionFailure> Courier::receive()
+{
+    return connection_.receive([this](std::string_view frame) {
+        const auto answer = readAnswer(frame, decoder_);
+        return answer && take(*answer);
+    });
+}
+
+bool Courier::take(const AnswerFrame& answer)
+{
+    if (answer.call != traceRequest || !settings_.tracer)
+        return calls_.answer(answer);
+    TraceDescriptors descriptors = connection_.takeDescriptors();
+    return !descriptors[0] || settings_.tracer->attach(std::move(descriptors)); // without any, nobody is to trace
+}
+
+bool Courier::canTakeCalls() const noexcept
+{
+    return connection_.unsentBytes() < mostUnsentBytes && calls_.unanswered() < settings_.unansweredLimit;
+}
+
+// A call leaves the mailbox only when it is known to the table: whatever fails in between, it is answered once.
+void Courier::takeCalls()
+{
+    while (canTakeCalls()) {
+        const auto record = nextRecord();
+        if (!record)
+            return;
+        readCall(*record, call_);
+        connection_.append(lastCall_ + 1, call_);
+        rememberWhetherStarted(call_.head);
+        calls_.add(lastCall_ + 1, call_.head);
+        ++lastCall_;
+        delete call_.head.entries;
+        popRecord();
+        pause_ = shortestPause;
+    }
+}
+
+std::optional<std::string_view> Courier::nextRecord() noexcept
+{
+    return firstCalls_.empty() ? mailbox_.front() : firstCalls_.front();
+}
+
+void Courier::popRecord() noexcept
+{
+    if (firstCalls_.empty())
+        return mailbox_.popFront();
+    firstCallsBytes_ -= firstCalls_.front().size();
+    firstCalls_.pop_front();
+}
+
+kesto_status Courier::putFirst(const CallHead& head, std::string_view reporters, std::string_view entries) noexcept
+{
+    const std::size_t size = sizeof head + reporters.size() + entries.size();
+    if (firstCallsBytes_ + size > settings_.queueBytes)
+        return KESTO_QUEUE_FULL;
+    try {
+        std::string record(bytesOf(head));
+        record.append(reporters).append(entries);
+        firstCalls_.push_back(std::move(record));
+    } catch (const std::bad_alloc&) {
+        return KESTO_OUT_OF_MEMORY;
+    }
+    firstCallsBytes_ += size;
+    return KESTO_OK;
+}
+
+void Courier::rememberWhetherStarted(const CallHead& head)
+{
+    switch (head.operation) {
+    case KESTO_OPERATION_START_SESSION: startedReporters_.insert(head.reporter); break;
+    case KESTO_OPERATION_CREATE_SESSION:
+    case KESTO_OPERATION_STOP_SESSION:
+    case KESTO_OPERATION_DESTROY_SESSION: startedReporters_.erase(head.reporter); break;
+    default: break;
+    }
+}
+
+void Courier::loseWaitingCalls(kesto_status status) noexcept
+{
+    while (const auto record = nextRecord()) {
+        const CallHead head = readHead(*record);
+        const std::unique_ptr<std::string> entries(head.entries);
+        popRecord();
+        if (head.operation == KESTO_OPERATION_SEND)
+            ++counters_.lost;
+        answerWithError(++lastCall_, head.operation, head.reporter, Callback(head.callback), status);
+    }
+}
+
+bool Courier::looksByItself() const noexcept
+{
+    return !settings_.wakeOnSend && (!startedReporters_.empty() || calls_.unanswered() > 0);
+}
+
+// How long to wait for the socket and the doorbell. Says so to the callers when messages are to ring.
+Courier::Milliseconds Courier::longestWait() noexcept
+{
+    if (!canTakeCalls())
+        return forever; // the service has to do something first, and the socket tells when it has
+    if (nextRecord())
+        return Milliseconds(0);
+    if (looksByItself())
+        return pause_;
+    // What is still being put in does not ring any more, but will be there in a moment.
+    Milliseconds wait = mailbox_.fallAsleep() ? forever : shortestPause;
+    if (retryAt_ && state_.load() == KESTO_STATE_DISCONNECTED) {
+        const auto untilRetry = std::chrono::ceil<Milliseconds>(*retryAt_ - Clock::now());
+        wait = std::max(Milliseconds(0), wait == forever ? untilRetry : std::min(wait, untilRetry));
+    }
+    return wait;
+}
+
+// Waits until there is something to do. True when the socket has something to read.
+bool Courier::wait()
+{
+    const short writing = connection_.unsentBytes() > 0 ? POLLOUT : 0;
+    std::array<pollfd, 2> watched{
+        {{mailbox_.doorbell(), POLLIN, 0}, {connection_.descriptor(), static_cast<short>(POLLIN | writing), 0}}};
+    constexpr std::int64_t most = std::numeric_limits<int>::max();
+    const auto timeout = static_cast<int>(std::min<std::int64_t>(longestWait().count(), most));
+    const int ready = ::poll(watched.data(), watched.size(), timeout);
+    mailbox_.wakeUp((watched[0].revents & POLLIN) != 0);
+    if (ready == 0)
+        pause_ = std::min(pause_ * 2, longestPause);
+    return (watched[1].revents & (POLLIN | POLLHUP | POLLERR)) != 0;
+}
+
+void Courier::changeState(kesto_state state, ConnectionFailure failure)
+{
+    state_.store(state);
+    std::uint32_t retryAfter = std::numeric_limits<std::uint32_t>::max();
+    if (state == KESTO_STATE_DISCONNECTED && retryAt_) {
+        const auto until = std::chrono::ceil<Milliseconds>(*retryAt_ - Clock::now());
+        retryAfter = static_cast<std::uint32_t>(std::max<std::int64_t>(0, until.count()));
+    }
+    isTellingState_.store(true, std::memory_order_relaxed);
+    settings_.stateChanged({state, failure.reason, failure.systemError, retryAfter, connection_.path().c_str()});
+    isTellingState_.store(false, std::memory_order_relaxed);
+}
+
+} // namespace libkesto

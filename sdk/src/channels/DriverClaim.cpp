@@ -1,0 +1,145 @@
+// What is left of others is found by looking through the driver's folders, since nobody else knows where they were.
+#include "channels/DriverClaim.h"
+
+#include "platform/linux/channels/ChannelOwner.h"
+#include "platform/linux/files/FilesAt.h"
+
+#include <fcntl.h>
+#include <limits>
+#include <map>
+#include <sys/stat.h>
+#include <unistd.h>
+#include <utility>
+#include <vector>
+
+namespace libkesto {
+namespace {
+
+using platform::FileDescriptor;
+
+std::vector<std::string> namesIn(int folder)
+{
+    return platform::namesIn(folder, std::numeric_limits<std::size_t>::max()).value_or(std::vector<std::string>());
+}
+
+// A folder in which nobody but this user and the administrator can exchange anything.
+FileDescriptor openOwn(int parent, const std::string& name)
+{
+    auto folder = platform::openDirectoryAt(parent, name);
+    struct stat status = {};
+    const bool isOwn =
+        folder && ::fstat(folder->get(), &status) == 0 && (status.st_uid == ::geteuid() || status.st_uid == 0);
+    return isOwn ? *std::move(folder) : FileDescriptor();
+}
+
+class Clearance {
+public:
+    explicit Clearance(int driverFolder) : driver_(driverFolder) { }
+
+    void run()
+    {
+        const auto names = namesIn(driver_);
+        for (const std::string& name : names)
+            clearGroup(name);
+        for (const std::string& name : names) // last: they are what the others are known by
+            if (isGone(platform::ownerOfChannelOwnerFile(name)))
+                remove(driver_, name);
+    }
+
+private:
+    void clearGroup(const std::string& name)
+    {
+        const FileDescriptor group = openOwn(driver_, name);
+        bool isClearer = false;
+        for (const std::string& subgroup : group ? namesIn(group.get()) : std::vector<std::string>())
+            isClearer = clearSubgroup(group.get(), subgroup) || isClearer;
+        if (isClearer)
+            ::unlinkat(driver_, name.c_str(), AT_REMOVEDIR); // if it is empty
+    }
+
+    // Whether something was removed.
+    bool clearSubgroup(int group, const std::string& name)
+    {
+        const FileDescriptor subgroup = openOwn(group, name);
+        bool isClearer = false;
+        for (const std::string& file : subgroup ? namesIn(subgroup.get()) : std::vector<std::string>())
+            if (isGone(file.starts_with('.') ? platform::ownerOfChannelTemporaryFile(file)
+                                             : ownerOfChannel(subgroup.get(), file)))
+                isClearer = remove(subgroup.get(), file) || isClearer;
+        if (isClearer)
+            ::unlinkat(group, name.c_str(), AT_REMOVEDIR);
+        return isClearer;
+    }
+
+    // Valid until the next one.
+    std::string_view ownerOfChannel(int folder, const std::string& name)
+    {
+        text_ = platform::readFileAt(folder, name, longestLine).value_or(std::string());
+        std::string_view text = text_;
+        return platform::takeChannelOwner(text);
+    }
+
+    bool isGone(std::string_view owner)
+    {
+        if (owner.empty())
+            return false;
+        const auto known = owners_.find(owner);
+        if (known != owners_.end())
+            return known->second;
+        return owners_.emplace(owner, platform::isChannelOwnerGone(driver_, owner)).first->second;
+    }
+
+    static bool remove(int folder, const std::string& name)
+    {
+        struct stat status = {};
+        return ::fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(status.st_mode)
+            && status.st_uid == ::geteuid() && ::unlinkat(folder, name.c_str(), 0) == 0;
+    }
+
+    static constexpr std::size_t longestLine = 64;
+
+    const int driver_;
+    std::string text_;
+    std::map<std::string, bool, std::less<>> owners_; // whether they are gone
+};
+
+} // namespace
+
+DriverClaim::DriverClaim(std::string owner)
+    : owner_(std::move(owner)),
+      fileName_(platform::channelOwnerFileName(owner_))
+{
+}
+
+DriverClaim::~DriverClaim()
+{
+    if (file_)
+        ::unlinkat(folder_.get(), fileName_.c_str(), 0);
+}
+
+void DriverClaim::renew(int driverFolder)
+{
+    if (holds(driverFolder))
+        return;
+    file_ = platform::makeChannelOwnerFile(driverFolder, owner_);
+    folder_ = FileDescriptor(::fcntl(driverFolder, F_DUPFD_CLOEXEC, 0));
+    line_ = file_ ? platform::channelOwnerLine(owner_) : std::string();
+    Clearance(driverFolder).run();
+}
+
+bool DriverClaim::holds(int driverFolder) const noexcept
+{
+    struct stat held = {};
+    struct stat there = {};
+    return file_ && ::fstat(file_.get(), &held) == 0
+        && ::fstatat(driverFolder, fileName_.c_str(), &there, AT_SYMLINK_NOFOLLOW) == 0 && held.st_dev == there.st_dev
+        && held.st_ino == there.st_ino;
+}
+
+bool DriverClaim::isLost() const noexcept
+{
+    struct stat status = {};
+    return file_ && ::fstat(file_.get(), &status) == 0 && status.st_nlink == 0;
+}
+
+} // namespace libkesto

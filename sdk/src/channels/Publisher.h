@@ -1,0 +1,98 @@
+// What owns channels: writes their files, by a thread of its own and for whoever asks, and takes them away again.
+//
+// The thread sleeps until the first change, writes what has changed, and rests: so a file is never written more often
+// than once an interval, and a change after a quiet time is seen at once. It rests longer when there is more to
+// write than it should spend its time with, and when files cannot be written.
+#pragma once
+
+#include "Counters.h"
+#include "channels/ChangeBell.h"
+#include "channels/Channel.h"
+#include "channels/ChannelFolder.h"
+#include "foundation/Mutex.h"
+
+#include <atomic>
+#include <chrono>
+#include <expected>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <sys/types.h>
+#include <thread>
+#include <unistd.h>
+#include <vector>
+
+namespace libkesto {
+
+struct PublisherSettings {
+    std::string root;
+    std::chrono::milliseconds writeInterval;
+    std::optional<std::chrono::milliseconds> refreshInterval; // nothing: never
+};
+
+} // namespace libkesto
+
+// The opaque type of the interface. Any thread.
+struct kesto_publisher final {
+public:
+    using Settings = libkesto::PublisherSettings;
+    using Time = kesto_channel::Time;
+
+    // Null, with `errno`, when the system has no descriptor or no thread. May throw std::bad_alloc.
+    [[nodiscard]] static std::unique_ptr<kesto_publisher> create(Settings settings);
+    ~kesto_publisher();
+    kesto_publisher(const kesto_publisher&) = delete;
+    kesto_publisher& operator=(const kesto_publisher&) = delete;
+
+    // Whether this process made it. In a child that was forked off, the thread, the lock and the files are the
+    // parent's.
+    [[nodiscard]] bool isOfThisProcess() const noexcept { return process_ == ::getpid(); }
+    // What channels tell their changes.
+    [[nodiscard]] libkesto::ChangeBell& bell() noexcept { return bell_; }
+    // Writes the channel's first file; null, and the status, when it cannot be. May throw std::bad_alloc.
+    [[nodiscard]] std::expected<kesto_channel*, kesto_status> add(std::unique_ptr<kesto_channel> channel,
+                                                                  libkesto::ChannelPlace place, std::string name);
+    // Destroys the channel and removes its file.
+    void remove(const kesto_channel& channel) noexcept;
+    // Writes whatever may not be up to date in the files. KESTO_SYSTEM_ERROR, with `errno`, when a file cannot be.
+    [[nodiscard]] kesto_status flush() noexcept;
+    [[nodiscard]] kesto_publisher_statistics statistics() const noexcept;
+    [[nodiscard]] const std::string& root() const noexcept { return settings_.root; }
+
+private:
+    struct Published {
+        std::unique_ptr<kesto_channel> channel;
+        std::shared_ptr<libkesto::ChannelFolder> folder;
+        std::string name;
+    };
+
+    kesto_publisher(Settings settings, platform::FileDescriptor doorbell);
+    [[nodiscard]] bool start() noexcept;
+    void run() noexcept;
+    void rest(Time end) noexcept;
+    void sleepUntilNeeded() noexcept;
+    [[nodiscard]] bool isRefreshDue(Time now) const noexcept KESTO_REQUIRES(lock_);
+    // 0, or the `errno` of a file that could not be written.
+    int write(bool isRefresh) noexcept KESTO_REQUIRES(lock_);
+    int write(Published& published, Time now) noexcept KESTO_REQUIRES(lock_);
+    [[nodiscard]] std::shared_ptr<libkesto::ChannelFolder> folder(libkesto::ChannelPlace place) KESTO_REQUIRES(lock_);
+
+    const pid_t process_; // that made it
+    const Settings settings_;
+    const std::string owner_; // what it calls itself in its files
+    libkesto::ChangeBell bell_;
+    libkesto::Counter filesWritten_;
+    libkesto::Counter filesFailed_;
+    std::atomic<bool> isEnding_ = false;
+
+    mutable foundation::Mutex lock_;
+    std::map<std::string, std::weak_ptr<libkesto::DriverClaim>> claims_ KESTO_GUARDED_BY(lock_); // by driver
+    std::map<libkesto::ChannelPlace, std::weak_ptr<libkesto::ChannelFolder>> folders_ KESTO_GUARDED_BY(lock_);
+    std::vector<Published> channels_ KESTO_GUARDED_BY(lock_);
+    std::size_t timedChannels_ KESTO_GUARDED_BY(lock_) = 0;
+    Time refreshed_ KESTO_GUARDED_BY(lock_);
+    std::string text_ KESTO_GUARDED_BY(lock_); // of the file that is being written
+
+    std::thread thread_;
+};

@@ -1,0 +1,133 @@
+// Heads that are written before their number is known, and widened in the rare case that one byte is too few.
+#include "wire/MessageEncoder.h"
+
+#include "foundation/cbor/Cbor.h"
+
+#include <new>
+#include <stdexcept>
+
+namespace libkesto {
+namespace {
+
+constexpr std::size_t longestHead = 9;
+
+// Runs what may be refused memory.
+template <typename Function> kesto_status withMemory(Function function) noexcept
+{
+    try {
+        function();
+        return KESTO_OK;
+    } catch (const std::bad_alloc&) {
+        return KESTO_OUT_OF_MEMORY;
+    } catch (const std::length_error&) {
+        return KESTO_OUT_OF_MEMORY;
+    }
+}
+
+} // namespace
+
+kesto_status MessageEncoder::reserve(std::size_t bytes) noexcept
+{
+    return bytes > KESTO_LARGEST_MESSAGE ? KESTO_TOO_LARGE : withMemory([&] { bytes_.reserve(bytes); });
+}
+
+void MessageEncoder::clear() noexcept
+{
+    bytes_.clear();
+    containers_.front() = {};
+    depth_ = 0;
+    hasKey_ = false;
+    failure_ = KESTO_OK;
+}
+
+kesto_status MessageEncoder::fail(kesto_status status) noexcept
+{
+    if (failure_ == KESTO_OK)
+        failure_ = status;
+    return failure_;
+}
+
+kesto_status MessageEncoder::status() const noexcept
+{
+    if (failure_ != KESTO_OK)
+        return failure_;
+    return depth_ > 0 || hasKey_ ? KESTO_MISNESTED : KESTO_OK;
+}
+
+// Writes `size` bytes and a head, if there is room for them and a failure has not come first.
+template <typename Write> kesto_status MessageEncoder::add(std::size_t size, Write write) noexcept
+{
+    if (failure_ != KESTO_OK)
+        return failure_;
+    if (size > KESTO_LARGEST_MESSAGE || bytes_.size() + longestHead + size > KESTO_LARGEST_MESSAGE)
+        return fail(KESTO_TOO_LARGE);
+    if (const kesto_status status = withMemory(write); status != KESTO_OK)
+        return fail(status);
+    return KESTO_OK;
+}
+
+kesto_status MessageEncoder::addKey(std::string_view key) noexcept
+{
+    if (hasKey_ || !containers_[depth_].isDictionary)
+        return fail(KESTO_MISNESTED);
+    if (!foundation::isValidUtf8(key))
+        return fail(KESTO_INVALID_UTF8);
+    hasKey_ = true;
+    return add(key.size(), [&] { foundation::appendCborText(key, bytes_); });
+}
+
+// Makes what comes next the value of the key, or an element of the array.
+bool MessageEncoder::takePlace() noexcept
+{
+    Container& container = containers_[depth_];
+    if (hasKey_ != container.isDictionary) {
+        fail(KESTO_MISNESTED);
+        return false;
+    }
+    hasKey_ = false;
+    ++container.count;
+    return true;
+}
+
+kesto_status MessageEncoder::addValue(const foundation::Value& value) noexcept
+{
+    if (!takePlace())
+        return failure_;
+    return add(0, [&] { foundation::appendCbor(value, bytes_); });
+}
+
+kesto_status MessageEncoder::addText(std::string_view text) noexcept
+{
+    if (!takePlace())
+        return failure_;
+    if (!foundation::isValidUtf8(text))
+        return fail(KESTO_INVALID_UTF8);
+    return add(text.size(), [&] { foundation::appendCborText(text, bytes_); });
+}
+
+kesto_status MessageEncoder::begin(bool isDictionary) noexcept
+{
+    if (!takePlace())
+        return failure_;
+    if (depth_ == KESTO_DEEPEST_NESTING)
+        return fail(KESTO_TOO_DEEP);
+    containers_[++depth_] = {isDictionary, 0, bytes_.size()};
+    return add(1, [&] { bytes_.push_back('\0'); });
+}
+
+kesto_status MessageEncoder::end() noexcept
+{
+    if (depth_ == 0 || hasKey_)
+        return fail(KESTO_MISNESTED);
+    const Container ended = containers_[depth_--];
+    return add(0, [&] {
+        std::string head; // short enough to need no allocation
+        if (ended.isDictionary)
+            foundation::appendCborMapHead(ended.count, head);
+        else
+            foundation::appendCborArrayHead(ended.count, head);
+        bytes_.replace(ended.head, 1, head);
+    });
+}
+
+} // namespace libkesto

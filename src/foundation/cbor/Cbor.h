@@ -1,0 +1,83 @@
+// Values as CBOR (RFC 8949): the language of the wire, and the compact form in which a session keeps its
+// messages.
+//
+// Read by own code rather than by a library, because the same few lines decode a frame from a hostile
+// client, remember the keys that a client repeats in every message, and walk a recorded payload
+// without unpacking it; the benchmarks set it beside libcbor.
+//
+// Null, booleans, integers, floats (16 bits are read as 32), text, arrays, maps with text keys, byte strings
+// (data) and epoch-based dates (tag 1) have a value; lengths may be indefinite. Everything else is refused.
+#pragma once
+
+#include "foundation/values/Value.h"
+
+#include <array>
+#include <cstddef>
+#include <cstdint>
+#include <expected>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace foundation {
+
+enum class CborError : std::uint8_t {
+    Truncated, // the bytes end inside an item
+    TrailingBytes, // bytes follow the item
+    TooDeep, // more containers inside each other than allowed
+    Malformed, // not well-formed CBOR
+    InvalidUtf8, // text that is not UTF-8
+    KeyNotText, // a map key of another type
+    Unsupported, // well-formed, but no value of ours: undefined, other tags and simple values
+    IntegerOutOfRange // below -2^63
+};
+
+// The error as words for a log line, such as "text is not valid UTF-8".
+[[nodiscard]] std::string_view description(CborError error) noexcept;
+
+// How deep foreign bytes may nest.
+constexpr unsigned cborMaximumDepth = 32;
+
+// Appends the value's encoding: shortest heads, definite lengths, floats in the width of their kind.
+void appendCbor(const Value& value, std::string& out);
+void appendCbor(const Dictionary& dictionary, std::string& out);
+
+// How many bytes that encoding takes.
+[[nodiscard]] std::size_t cborSize(const Dictionary& dictionary);
+
+// The heads by which whoever knows a message's shape encodes it without building values first.
+void appendCborInteger(std::uint64_t value, std::string& out);
+void appendCborText(std::string_view text, std::string& out);
+void appendCborArrayHead(std::uint64_t count, std::string& out);
+void appendCborMapHead(std::uint64_t count, std::string& out);
+inline void appendCborNull(std::string& out)
+{
+    out.push_back('\xF6');
+}
+
+// Decodes items from foreign bytes. One decoder a connection, used by one thread at a time: it remembers short keys and
+// the shapes of small maps, so that what every message repeats is made once.
+class CborDecoder {
+public:
+    // The one item that the bytes hold, all of them, with at most so many containers inside each other.
+    [[nodiscard]] std::expected<Value, CborError> decode(std::string_view bytes,
+                                                         unsigned maximumDepth = cborMaximumDepth);
+
+private:
+    friend class CborReader;
+    // A string with these characters, if it is remembered.
+    [[nodiscard]] const String* find(std::string_view key) const;
+    // A new string, remembered if it is short.
+    [[nodiscard]] String remember(std::string_view key);
+
+    // The place of the shape of a map of so many entries that begins with that key.
+    [[nodiscard]] Reference<DictionaryShape>& shapeOf(std::string_view firstKey, std::uint64_t count);
+
+    static constexpr std::size_t longestRememberedKey = 64;
+    static constexpr std::size_t rememberedKeys = 256;
+    static constexpr std::size_t rememberedShapes = 16;
+    std::vector<String> keys_; // from the first key on, by a hash of their characters; a newcomer takes the place
+    std::array<Reference<DictionaryShape>, rememberedShapes> shapes_; // by a hash, too
+};
+
+} // namespace foundation

@@ -1,0 +1,67 @@
+// What the readers of both forms of property lists have in common, for them alone: the first failure ends the reading,
+// what they make is counted, and characters become UTF-8.
+#pragma once
+
+#include "foundation/plist/PropertyList.h"
+
+#include <bit>
+#include <limits>
+#include <optional>
+#include <utility>
+
+namespace foundation {
+
+// After a failure every step does nothing and yields null, so that only loops look whether there was one.
+class PropertyListReader {
+protected:
+    explicit PropertyListReader(const PropertyListLimits& limits) : limits_(limits), objectsLeft_(limits.objects) { }
+
+    // Null, for whoever has a value to return. Of several failures the first counts.
+    Value failWith(PropertyListError error, std::string text)
+    {
+        if (!failure_)
+            failure_ = {error, std::move(text)};
+        return {};
+    }
+    [[nodiscard]] bool failed() const noexcept { return failure_.has_value(); }
+
+    std::expected<Value, PropertyListFailure> outcome(Value value)
+    {
+        if (failure_)
+            return std::unexpected(*std::move(failure_));
+        return value;
+    }
+
+    // Takes so many objects off what may still be made; false when that are too many.
+    [[nodiscard]] bool spendObjects(std::uint64_t count) noexcept
+    {
+        if (count > objectsLeft_)
+            return false;
+        objectsLeft_ -= count;
+        return true;
+    }
+
+    const PropertyListLimits limits_;
+
+private:
+    std::size_t objectsLeft_;
+    std::optional<PropertyListFailure> failure_;
+};
+
+// Signed where that holds it, so that one integer has one kind, however it was written.
+inline Number propertyListInteger(std::uint64_t value) noexcept
+{
+    return std::in_range<std::int64_t>(value) ? Number(static_cast<std::int64_t>(value)) : Number(value);
+}
+
+// False, and nothing appended, for what is no Unicode character.
+[[nodiscard]] bool appendUtf8(std::uint32_t character, std::string& out);
+// Nothing for what is not well-formed. A byte order mark is a character like any other.
+[[nodiscard]] std::optional<std::string> utf8FromUtf16(std::string_view bytes, std::endian order);
+
+[[nodiscard]] std::expected<Value, PropertyListFailure> readXmlPropertyList(std::string_view bytes,
+                                                                            const PropertyListLimits& limits);
+[[nodiscard]] std::expected<Value, PropertyListFailure> readBinaryPropertyList(std::string_view bytes,
+                                                                               const PropertyListLimits& limits);
+
+} // namespace foundation

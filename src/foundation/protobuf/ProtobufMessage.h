@@ -1,0 +1,33 @@
+// What every record of protocol buffers can do: be read, be written, and be shown.
+#pragma once
+
+#include "foundation/protobuf/ProtobufReader.h"
+#include "foundation/protobuf/ProtobufTextFormatter.h"
+#include "foundation/protobuf/ProtobufWriter.h"
+
+#include <expected>
+#include <string_view>
+
+namespace foundation {
+
+// Plain data. Distinct messages may be used from different threads at once.
+class ProtobufMessage {
+public:
+    virtual ~ProtobufMessage() = default;
+
+    // Takes over every field that it knows, up to the end of the input: of one that comes again the last counts, and
+    // one that does not come stays as it is. When the input is broken, the fields before that place have been taken.
+    [[nodiscard]] virtual std::expected<void, ProtobufError> readFrom(ProtobufReader& reader) = 0;
+    virtual void writeTo(ProtobufWriter& writer) const = 0;
+    // As an object of that name, its fields in the order of their names.
+    virtual void formatText(ProtobufTextFormatter& formatter, std::string_view name) const = 0;
+
+protected:
+    ProtobufMessage() = default;
+    ProtobufMessage(const ProtobufMessage&) = default;
+    ProtobufMessage(ProtobufMessage&&) = default;
+    ProtobufMessage& operator=(const ProtobufMessage&) = default;
+    ProtobufMessage& operator=(ProtobufMessage&&) = default;
+};
+
+} // namespace foundation

@@ -1,0 +1,43 @@
+// JSON for people, written piece by piece: indented, one member a line, and never in memory as a whole.
+#pragma once
+
+#include "foundation/cbor/CborView.h"
+#include "foundation/values/Value.h"
+
+#include <functional>
+#include <memory>
+#include <string_view>
+
+namespace foundation {
+
+// Calls come in the order of the text; one thread at a time.
+class PrettyJsonWriter {
+public:
+    using Sink = std::function<void(std::string_view text)>;
+
+    // The sink gets the text in pieces of some 64 KiB, the last when the writer is destroyed.
+    explicit PrettyJsonWriter(Sink sink);
+    ~PrettyJsonWriter();
+
+    void beginArray();
+    void endArray();
+    void beginObject();
+    void endObject();
+    void key(std::string_view key);
+    void write(const Value& value);
+    void write(CborItem item);
+    // A key and its value. Their text is put into `text`: it may be written instead, wherever as many objects and
+    // arrays are open.
+    void writeMember(std::string_view key, CborItem value, std::string& text);
+    void writeMember(std::string_view text);
+
+    // False once a value held NaN or infinity, which JSON cannot say. What was written is then of no use, and nothing
+    // more is written.
+    [[nodiscard]] bool isWhole() const;
+
+private:
+    class Implementation;
+    std::unique_ptr<Implementation> implementation_;
+};
+
+} // namespace foundation

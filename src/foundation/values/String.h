@@ -1,0 +1,77 @@
+// Immutable shared text, and data, which is the same without the promise of being text.
+//
+// A string has an identity beside its characters: a copy is the same object, a string made anew from
+// equal characters is not. The service has one constant that only in-process code can hand in, and
+// tells it by that.
+#pragma once
+
+#include "foundation/values/Reference.h"
+
+#include <compare>
+#include <cstddef>
+#include <new>
+#include <string_view>
+#include <utility>
+
+namespace foundation {
+
+// The characters behind a `String`: length and bytes in one allocation, of `malloc`, so that a `StringBuilder` can
+// have it grown in place.
+class StringObject : public ReferenceCounted {
+public:
+    static const StringObject* create(std::string_view text);
+    // Makes memory into an object; the bytes stand there already, behind room for the object.
+    static const StringObject* createIn(void* memory, std::size_t size) noexcept
+    {
+        return new (memory) StringObject(size);
+    }
+    static void destroy(const StringObject* object) noexcept;
+
+    [[nodiscard]] std::string_view view() const noexcept
+    {
+        return {reinterpret_cast<const char*>(this + 1), size_}; // the bytes stand right behind the object
+    }
+
+private:
+    explicit StringObject(std::size_t size) noexcept : size_(size) { }
+    ~StringObject() = default;
+
+    std::size_t size_;
+};
+
+// UTF-8 text. Whoever makes one from foreign bytes validates them first (`isValidUtf8`). Any thread.
+class String {
+public:
+    String() noexcept = default; // the empty string
+    String(std::string_view text);
+    String(const char* text) : String(std::string_view(text)) { }
+
+    [[nodiscard]] std::string_view view() const noexcept { return object_ ? object_->view() : std::string_view(); }
+    operator std::string_view() const noexcept { return view(); }
+    [[nodiscard]] bool empty() const noexcept { return view().empty(); }
+
+    // Whether both are one object; all empty strings are.
+    [[nodiscard]] bool isSameObject(const String& other) const noexcept { return object_.get() == other.object_.get(); }
+
+    friend bool operator==(const String& left, const String& right) noexcept
+    {
+        return left.isSameObject(right) || left.view() == right.view();
+    }
+    friend bool operator==(const String& left, std::string_view right) noexcept { return left.view() == right; }
+
+private:
+    friend class StringBuilder;
+    friend class Value;
+    explicit String(Reference<StringObject> object) noexcept : object_(std::move(object)) { }
+
+    Reference<StringObject> object_;
+};
+
+// The text up to so many bytes, and no part of a character.
+[[nodiscard]] std::string_view cutBetweenCharacters(std::string_view text, std::size_t longest) noexcept;
+
+// Whether the bytes are well-formed UTF-8 (RFC 3629: no overlong forms, no surrogates, nothing above
+// U+10FFFF).
+[[nodiscard]] bool isValidUtf8(std::string_view bytes) noexcept;
+
+} // namespace foundation

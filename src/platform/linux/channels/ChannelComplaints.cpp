@@ -1,0 +1,69 @@
+// Problems are kept sorted, so that to look one up is cheap however many there are.
+#include "platform/linux/channels/ChannelComplaints.h"
+
+#include "platform/linux/files/SystemErrorText.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace platform {
+
+ChannelComplaints::Memory ChannelComplaints::addQuestion()
+{
+    const foundation::Lock lock(lock_);
+    return memories_.emplace_back(std::make_shared<Findings>());
+}
+
+void ChannelComplaints::forgetDroppedQuestions()
+{
+    const foundation::Lock lock(lock_);
+    std::erase_if(memories_, [](const Memory& memory) { return memory.use_count() == 1; });
+}
+
+void ChannelComplaints::tell(Findings found, const Memory& memory)
+{
+    std::ranges::sort(found.problems);
+    const foundation::Lock lock(lock_);
+    sayProblems(found.problems);
+    sayWhatIsLeftOut(found.leftOut);
+    *memory = std::move(found);
+}
+
+void ChannelComplaints::tellUnreadable(std::error_code error, const Memory& memory)
+{
+    const foundation::Lock lock(lock_);
+    if (!anyRemembers([error](const Findings& each) { return each.error == error; }))
+        log_.error("only sound cards have channels: {} cannot be read: {}", root_.native(),
+                   systemErrorText(error.value()));
+    memory->error = error;
+}
+
+template <typename Condition> bool ChannelComplaints::anyRemembers(Condition condition) const
+{
+    return std::ranges::any_of(memories_, [&](const Memory& memory) { return condition(*memory); });
+}
+
+void ChannelComplaints::sayProblems(const std::vector<ChannelProblem>& problems) const
+{
+    std::size_t count = 0;
+    for (const ChannelProblem& problem : problems) {
+        if (anyRemembers([&](const Findings& each) { return std::ranges::binary_search(each.problems, problem); }))
+            continue;
+        if (++count <= mostNamed)
+            log_.error("channel {} is left out: {}", problem.path, problem.reason);
+    }
+    if (count > mostNamed)
+        log_.error("{} more channels are left out", count - mostNamed);
+}
+
+void ChannelComplaints::sayWhatIsLeftOut(LeftOutChannels leftOut) const
+{
+    for (std::size_t LeftOutChannels::* bound :
+         {&LeftOutChannels::beyondChannels, &LeftOutChannels::beyondBytes, &LeftOutChannels::beyondNames})
+        if (anyRemembers([&](const Findings& each) { return each.leftOut.*bound > 0; }))
+            leftOut.*bound = 0;
+    for (const std::string& line : leftOut.inWords(limits_))
+        log_.error("{}", line);
+}
+
+} // namespace platform

@@ -1,0 +1,45 @@
+// The reporting channels of this system: those that programs publish in the channel tree, and what the kernel tells
+// about its sound cards.
+//
+// A subscription is to the question and not to the answer: every sample holds what is there when it is taken, so that
+// channels may come and go.
+#pragma once
+
+#include "platform/linux/channels/ChannelComplaints.h"
+#include "platform/linux/channels/ChannelTree.h"
+#include "platform/linux/channels/SoundCards.h"
+#include "platform/linux/log/ProviderLog.h"
+
+namespace platform {
+
+// One thread at a time for each set of channels; otherwise any. Error codes are the system's (`errno`).
+class LinuxReportingChannels final : public ReportingChannels {
+public:
+    LinuxReportingChannels(const std::filesystem::path& channelRoot, std::filesystem::path soundRoot, ProviderLog log,
+                           const ChannelTree::Limits& limits = {})
+        : tree_(channelRoot, limits),
+          soundCards_(std::move(soundRoot)),
+          complaints_(channelRoot, limits, log)
+    {
+    }
+
+    // When the tree cannot be read, the channels of the sound cards come back beside the error.
+    FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
+                                      std::optional<std::string_view> subgroup) override;
+    [[nodiscard]] std::size_t channelCount(const ChannelSet& channels) const override;
+    Subscribed createSubscription(const ChannelSet& channels) override;
+    // When the tree cannot be read, the sample holds those of the sound cards; the error, where they have none.
+    std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
+                                                                        const ChannelSet& channels) override;
+    std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,
+                                                                           const ReportingSample& to) override;
+
+private:
+    struct Selection;
+
+    const ChannelTree tree_;
+    const SoundCards soundCards_;
+    ChannelComplaints complaints_;
+};
+
+} // namespace platform

@@ -1,0 +1,203 @@
+// One loop around epoll. Accepting is part of it, in small helpings, and pauses when descriptors run out, so that
+// neither many new clients nor too many take anything from those that are there.
+#include "platform/linux/connection/LinuxConnectionListener.h"
+
+#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/queues/SerialQueue.h"
+
+#include <algorithm>
+#include <array>
+#include <cassert>
+#include <cerrno>
+#include <sys/epoll.h>
+#include <sys/eventfd.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <utility>
+
+namespace platform {
+namespace {
+
+constexpr int mostAcceptedAtOnce = 16; // so that the clients which are there get their turn
+constexpr std::size_t mostEventsAtOnce = 64;
+
+std::error_code systemError()
+{
+    return {errno, std::generic_category()};
+}
+
+std::size_t mostConnections()
+{
+    rlimit limit = {};
+    ::getrlimit(RLIMIT_NOFILE, &limit);
+    const std::size_t descriptors = limit.rlim_cur;
+    return std::max(descriptors, LinuxConnectionListener::descriptorsForTheRest + 1)
+        - LinuxConnectionListener::descriptorsForTheRest;
+}
+
+} // namespace
+
+std::expected<std::unique_ptr<LinuxConnectionListener>, std::error_code>
+LinuxConnectionListener::create(ListeningSocket socket, LogCategory& log)
+{
+    FileDescriptor epoll(::epoll_create1(EPOLL_CLOEXEC));
+    if (!epoll)
+        return std::unexpected(systemError());
+    FileDescriptor wake(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
+    if (!wake)
+        return std::unexpected(systemError());
+    std::unique_ptr<LinuxConnectionListener> listener(
+        new LinuxConnectionListener(std::move(socket), std::move(epoll), std::move(wake), log));
+    if (!listener->watch(EPOLL_CTL_ADD, listener->wake_.get(), EPOLLIN, &listener->wake_)
+        || !listener->watch(EPOLL_CTL_ADD, listener->socket_.descriptor(), 0, &listener->socket_))
+        return std::unexpected(systemError());
+    return listener;
+}
+
+LinuxConnectionListener::LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake,
+                                                 LogCategory& log)
+    : socket_(std::move(socket)),
+      wake_(std::move(wake)),
+      hub_(std::make_shared<ConnectionHub>(std::move(epoll), log)),
+      mostConnections_(mostConnections()),
+      mostConnectionsOfAUser_(mostConnections_ - mostConnections_ / partForOthers)
+{
+}
+
+bool LinuxConnectionListener::watch(int operation, int descriptor, std::uint32_t events, void* tag)
+{
+    epoll_event event = {};
+    event.events = events;
+    event.data.ptr = tag;
+    return ::epoll_ctl(hub_->epoll.get(), operation, descriptor, &event) == 0;
+}
+
+void LinuxConnectionListener::resume()
+{
+    assert(delegate_ != nullptr);
+    hub_->connectionThread = std::this_thread::get_id();
+    resumeAccepting();
+    if (listeningHandler_)
+        listeningHandler_();
+    serve();
+    for (const auto& [identity, connection] : std::exchange(connections_, {}))
+        connection->invalidate();
+}
+
+// What little the clients ask for is done by this thread once it has read all that is there.
+void LinuxConnectionListener::serve()
+{
+    SerialQueue::Helper helper;
+    while (!isStopping_) {
+        std::array<epoll_event, mostEventsAtOnce> events;
+        const int count = ::epoll_wait(hub_->epoll.get(), events.data(), events.size(), waitingTime());
+        for (int index = 0; index < count; ++index)
+            handle(events[static_cast<std::size_t>(index)]);
+        if (acceptAgainAt_ && *acceptAgainAt_ <= Clock::now())
+            resumeAccepting();
+        helper.help();
+    }
+}
+
+void LinuxConnectionListener::stop()
+{
+    isStopping_ = true;
+    ::eventfd_write(wake_.get(), 1);
+}
+
+// In milliseconds, as epoll counts; rounded up, so that nothing is found too early.
+int LinuxConnectionListener::waitingTime() const
+{
+    if (!acceptAgainAt_)
+        return -1;
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*acceptAgainAt_ - Clock::now());
+    return static_cast<int>(std::max<std::chrono::milliseconds::rep>(left.count(), 0));
+}
+
+void LinuxConnectionListener::handle(const epoll_event& event)
+{
+    if (event.data.ptr == &socket_)
+        acceptWaiting();
+    else if (event.data.ptr != &wake_) // which only wakes
+        handle(*static_cast<LinuxConnection*>(event.data.ptr), event.events);
+}
+
+void LinuxConnectionListener::handle(LinuxConnection& connection, std::uint32_t events)
+{
+    if (connection.handle(events))
+        return;
+    forget(connection);
+    if (!isAccepting_)
+        resumeAccepting();
+}
+
+void LinuxConnectionListener::acceptWaiting()
+{
+    for (int accepted = 0; accepted < mostAcceptedAtOnce; ++accepted) {
+        if (connections_.size() >= mostConnections_)
+            return pauseAccepting(std::nullopt, EMFILE);
+        FileDescriptor socket(::accept4(socket_.descriptor(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));
+        if (socket) {
+            welcome(std::move(socket));
+        } else if (errno == EAGAIN) {
+            pauseIsLogged_ = false;
+            return;
+        } else if (errno != EINTR && errno != ECONNABORTED) {
+            return pauseAccepting(acceptingPause, errno);
+        }
+    }
+}
+
+void LinuxConnectionListener::welcome(FileDescriptor socket)
+{
+    ucred peer = {};
+    socklen_t size = sizeof peer;
+    if (::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0)
+        return; // gone already
+    User& user = users_[peer.uid];
+    if (user.connections == mostConnectionsOfAUser_) {
+        ++hub_->counters.refused;
+        if (!std::exchange(user.refusalIsLogged, true))
+            KESTO_LOG(hub_->log, Error, "user {} has {} connections and gets no more until one ends", peer.uid,
+                      user.connections);
+        return;
+    }
+    ++user.connections;
+    const auto connection =
+        std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid});
+    connections_.emplace(connection.get(), connection);
+    ++hub_->counters.accepted;
+    if (!delegate_->shouldAcceptNewConnection(*this, connection))
+        connection->invalidate();
+    handle(*connection, 0); // in case that it is over already
+}
+
+void LinuxConnectionListener::forget(const LinuxConnection& connection)
+{
+    const auto user = users_.find(connection.userIdentifier());
+    user->second.refusalIsLogged = false;
+    if (--user->second.connections == 0)
+        users_.erase(user);
+    connections_.erase(&connection);
+}
+
+// Without descriptors there is nothing to do about the clients that wait but to let them wait: asking again at
+// once would keep the thread busy for nothing.
+void LinuxConnectionListener::pauseAccepting(std::optional<Clock::duration> pause, int error)
+{
+    isAccepting_ = !watch(EPOLL_CTL_MOD, socket_.descriptor(), 0, &socket_);
+    if (pause)
+        acceptAgainAt_ = Clock::now() + *pause;
+    ++hub_->counters.acceptingPauses;
+    if (!std::exchange(pauseIsLogged_, true))
+        KESTO_LOG(hub_->log, Error, "new connections have to wait, with {} open: {}", connections_.size(),
+                  systemErrorText(error));
+}
+
+void LinuxConnectionListener::resumeAccepting()
+{
+    acceptAgainAt_.reset();
+    isAccepting_ = watch(EPOLL_CTL_MOD, socket_.descriptor(), EPOLLIN, &socket_);
+}
+
+} // namespace platform

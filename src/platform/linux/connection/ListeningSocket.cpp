@@ -1,0 +1,117 @@
+// A socket file that is in the way is removed only if nobody answers behind it: a service that was killed leaves
+// one, and one that runs must not lose its own.
+#include "platform/linux/connection/ListeningSocket.h"
+
+#include "platform/linux/files/SystemErrorText.h"
+
+#include <cerrno>
+#include <cstring>
+#include <fcntl.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <systemd/sd-daemon.h>
+
+namespace platform {
+namespace {
+
+using Failure = ListeningSocketFailure;
+
+std::unexpected<Failure> fail(ListeningSocketError error)
+{
+    return std::unexpected(Failure{error});
+}
+
+std::unexpected<Failure> failWithSystemError()
+{
+    return std::unexpected(Failure{ListeningSocketError::SystemError, errno});
+}
+
+FileDescriptor makeSocket()
+{
+    return FileDescriptor(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+}
+
+bool bindTo(const FileDescriptor& socket, const sockaddr_un& address)
+{
+    return ::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0;
+}
+
+// Whether the file is a socket that nobody holds any more. A full backlog refuses too, but with EAGAIN.
+std::expected<void, Failure> checkIsStale(const sockaddr_un& address)
+{
+    struct stat status = {};
+    if (::lstat(address.sun_path, &status) != 0)
+        return failWithSystemError();
+    if (!S_ISSOCK(status.st_mode))
+        return fail(ListeningSocketError::NotASocket);
+    const FileDescriptor probe = makeSocket();
+    if (!probe)
+        return failWithSystemError();
+    const bool refused = ::connect(probe.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0
+        && errno == ECONNREFUSED;
+    return refused ? std::expected<void, Failure>() : fail(ListeningSocketError::AlreadyInUse);
+}
+
+} // namespace
+
+std::string description(const ListeningSocketFailure& failure)
+{
+    switch (failure.error) {
+    case ListeningSocketError::NotOneUnixListener:
+        return "socket activation passed something else than one listening Unix stream socket";
+    case ListeningSocketError::PathTooLong: return "the path is too long for a socket";
+    case ListeningSocketError::NotASocket: return "something that is not a socket is in the way";
+    case ListeningSocketError::AlreadyInUse: return "another process listens there";
+    case ListeningSocketError::SystemError: return std::string(systemErrorText(failure.systemError));
+    }
+    return "unknown error";
+}
+
+std::expected<std::optional<ListeningSocket>, ListeningSocketFailure> ListeningSocket::passed()
+{
+    const int count = ::sd_listen_fds(1);
+    if (count == 0)
+        return std::nullopt;
+    if (count != 1 || ::sd_is_socket_unix(SD_LISTEN_FDS_START, SOCK_STREAM, 1, nullptr, 0) <= 0)
+        return fail(ListeningSocketError::NotOneUnixListener);
+    FileDescriptor descriptor(SD_LISTEN_FDS_START);
+    if (::fcntl(descriptor.get(), F_SETFL, O_NONBLOCK) != 0)
+        return failWithSystemError();
+    return ListeningSocket(std::move(descriptor), {});
+}
+
+ListeningSocket::Result ListeningSocket::bind(std::filesystem::path path, unsigned permissions)
+{
+    sockaddr_un address = {};
+    address.sun_family = AF_UNIX;
+    if (path.native().size() >= sizeof address.sun_path)
+        return fail(ListeningSocketError::PathTooLong);
+    std::memcpy(address.sun_path, path.c_str(), path.native().size());
+
+    FileDescriptor descriptor = makeSocket();
+    if (!descriptor)
+        return failWithSystemError();
+    if (!bindTo(descriptor, address)) {
+        if (errno != EADDRINUSE)
+            return failWithSystemError();
+        if (const auto stale = checkIsStale(address); !stale)
+            return std::unexpected(stale.error());
+        ::unlink(address.sun_path);
+        if (!bindTo(descriptor, address))
+            return failWithSystemError();
+    }
+    ListeningSocket socket(std::move(descriptor), std::move(path));
+    // In this order: until it listens, nobody can use permissions that the umask left too wide.
+    if (::chmod(address.sun_path, permissions) != 0 || ::listen(socket.descriptor(), SOMAXCONN) != 0)
+        return failWithSystemError();
+    return socket;
+}
+
+ListeningSocket::~ListeningSocket()
+{
+    if (descriptor_ && !boundPath_.empty())
+        ::unlink(boundPath_.c_str());
+}
+
+} // namespace platform

@@ -1,0 +1,70 @@
+// The socket on which the service is reached: one that the service manager opened and passed on, or one bound
+// at a path.
+#pragma once
+
+#include "platform/linux/files/FileDescriptor.h"
+
+#include <expected>
+#include <filesystem>
+#include <optional>
+#include <string>
+
+namespace platform {
+
+enum class ListeningSocketError : std::uint8_t {
+    NotOneUnixListener, // socket activation passed something else than one listening Unix stream socket
+    PathTooLong, // longer than the address of a Unix socket
+    NotASocket, // something that is not a socket stands at the path
+    AlreadyInUse, // another process listens at the path
+    SystemError // the system refused, for the reason given beside
+};
+
+// What went wrong, and `errno` where the system said why.
+struct ListeningSocketFailure {
+    ListeningSocketError error;
+    int systemError = 0;
+};
+
+// The failure as words for a log line, such as "another process listens there".
+[[nodiscard]] std::string description(const ListeningSocketFailure& failure);
+
+// A socket that is ready to be accepted from. The file of one that was bound here goes with it.
+class ListeningSocket {
+public:
+    using Result = std::expected<ListeningSocket, ListeningSocketFailure>;
+
+    // Who may connect, as permissions of the socket's file. Clients belong to any user, and every one of them is
+    // treated as hostile: by default all may.
+    static constexpr unsigned everyone = 0666;
+
+    // The socket that the service manager passed (LISTEN_FDS), or nothing when it passed none. To be asked once;
+    // the variables are then gone from the environment.
+    [[nodiscard]] static std::expected<std::optional<ListeningSocket>, ListeningSocketFailure> passed();
+
+    // Binds at the path. The file that a process left behind when it died is replaced; one behind which
+    // somebody listens, or that is no socket, is left alone.
+    [[nodiscard]] static Result bind(std::filesystem::path path, unsigned permissions = everyone);
+
+    ListeningSocket(ListeningSocket&&) noexcept = default;
+    ListeningSocket& operator=(ListeningSocket&& other) noexcept
+    {
+        std::swap(descriptor_, other.descriptor_);
+        std::swap(boundPath_, other.boundPath_);
+        return *this;
+    }
+    ~ListeningSocket();
+
+    [[nodiscard]] int descriptor() const noexcept { return descriptor_.get(); }
+
+private:
+    ListeningSocket(FileDescriptor descriptor, std::filesystem::path boundPath) noexcept
+        : descriptor_(std::move(descriptor)),
+          boundPath_(std::move(boundPath))
+    {
+    }
+
+    FileDescriptor descriptor_;
+    std::filesystem::path boundPath_; // empty when it was passed
+};
+
+} // namespace platform

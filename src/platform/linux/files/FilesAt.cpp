@@ -1,0 +1,152 @@
+// Thin over the kernel's *at calls: that none of them ever follows a link is what this file is for.
+#include "platform/linux/files/FilesAt.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <dirent.h>
+#include <fcntl.h>
+#include <fmt/format.h>
+#include <limits>
+#include <memory>
+#include <sys/random.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+namespace platform {
+namespace {
+
+constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
+constexpr unsigned deepestTree = 8; // that is removed; none of ours is deeper
+constexpr std::string_view temporaryBegin = ".kestod-";
+constexpr std::string_view temporaryEnd = ".tmp";
+
+std::error_code lastError()
+{
+    return {errno, std::generic_category()};
+}
+
+struct CloseDirectory {
+    void operator()(DIR* directory) const { ::closedir(directory); }
+};
+
+bool removeTree(int directory, const std::string& name, unsigned depth)
+{
+    if (::unlinkat(directory, name.c_str(), 0) == 0)
+        return true;
+    if (errno != EISDIR || depth == 0)
+        return false;
+    const auto opened = openDirectoryAt(directory, name);
+    const auto names = opened ? namesIn(opened->get(), everything) : std::unexpected(opened.error());
+    return names
+        && std::ranges::all_of(*names,
+                               [&](const std::string& inside) { return removeTree(opened->get(), inside, depth - 1); })
+        && ::unlinkat(directory, name.c_str(), AT_REMOVEDIR) == 0;
+}
+
+} // namespace
+
+std::expected<FileDescriptor, std::error_code> openDirectoryAt(int directory, const std::string& name)
+{
+    FileDescriptor opened(::openat(directory, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
+    if (!opened)
+        return std::unexpected(lastError());
+    return opened;
+}
+
+std::expected<std::vector<std::string>, std::error_code> namesIn(int directory, std::size_t most)
+{
+    // A descriptor of its own, since reading moves its place in the folder.
+    const int own = ::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
+    if (own < 0)
+        return std::unexpected(lastError());
+    const std::unique_ptr<DIR, CloseDirectory> stream(::fdopendir(own));
+    if (!stream) {
+        const auto error = lastError();
+        ::close(own);
+        return std::unexpected(error);
+    }
+    std::vector<std::string> names;
+    while (const dirent* entry = names.size() < most ? ::readdir(stream.get()) : nullptr)
+        if (const std::string_view name = entry->d_name; name != "." && name != "..")
+            names.emplace_back(name);
+    std::ranges::sort(names);
+    return names;
+}
+
+std::expected<std::string, std::error_code> readFileAt(int directory, const std::string& name, std::size_t most)
+{
+    const FileDescriptor file(
+        ::openat(directory, name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+    struct stat status = {};
+    if (!file || ::fstat(file.get(), &status) != 0)
+        return std::unexpected(lastError());
+    if (!S_ISREG(status.st_mode))
+        return std::unexpected(make_error_code(std::errc::invalid_argument));
+    constexpr std::size_t piece = 4096; // files of /proc have no size: only the end tells the length
+    std::string bytes;
+    std::size_t length = 0;
+    while (length < most) {
+        bytes.resize(std::min(most, length + piece));
+        const ssize_t count = ::read(file.get(), bytes.data() + length, bytes.size() - length);
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count < 0)
+            return std::unexpected(lastError());
+        if (count == 0)
+            break;
+        length += static_cast<std::size_t>(count);
+    }
+    bytes.resize(length);
+    return bytes;
+}
+
+std::string temporaryName()
+{
+    std::uint64_t number = 0;
+    if (::getrandom(&number, sizeof number, 0) != sizeof number)
+        number = static_cast<std::uint64_t>(::getpid());
+    return fmt::format("{}{:016x}{}", temporaryBegin, number, temporaryEnd);
+}
+
+bool isTemporaryName(std::string_view name)
+{
+    constexpr std::size_t digits = 16;
+    return name.size() == temporaryBegin.size() + digits + temporaryEnd.size() && name.starts_with(temporaryBegin)
+        && name.ends_with(temporaryEnd)
+        && name.substr(temporaryBegin.size(), digits).find_first_not_of("0123456789abcdef") == std::string_view::npos;
+}
+
+std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes)
+{
+    constexpr mode_t readableByGroup = 0640;
+    const FileDescriptor file(
+        ::openat(directory, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByGroup));
+    if (!file)
+        return lastError();
+    while (!bytes.empty()) {
+        const ssize_t count = ::write(file.get(), bytes.data(), bytes.size());
+        if (count < 0 && errno == EINTR)
+            continue;
+        if (count < 0)
+            return lastError();
+        bytes.remove_prefix(static_cast<std::size_t>(count));
+    }
+    return ::fsync(file.get()) == 0 ? std::error_code() : lastError();
+}
+
+std::uint64_t bytesOfFilesIn(int directory)
+{
+    std::uint64_t bytes = 0;
+    for (const std::string& name : namesIn(directory, everything).value_or(std::vector<std::string>()))
+        if (struct stat status = {};
+            ::fstatat(directory, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(status.st_mode))
+            bytes += static_cast<std::uint64_t>(status.st_size);
+    return bytes;
+}
+
+bool removeTreeAt(int directory, const std::string& name)
+{
+    return removeTree(directory, name, deepestTree);
+}
+
+} // namespace platform

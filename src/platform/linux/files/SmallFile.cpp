@@ -1,0 +1,49 @@
+// The size that the kernel tells is taken for a hint: files of /proc tell none, and others may grow meanwhile.
+#include "platform/linux/files/SmallFile.h"
+
+#include "platform/linux/files/FileDescriptor.h"
+
+#include <algorithm>
+#include <cerrno>
+#include <fcntl.h>
+#include <sys/stat.h>
+
+namespace platform {
+namespace {
+
+std::unexpected<std::error_code> systemError()
+{
+    return std::unexpected(std::error_code(errno, std::generic_category()));
+}
+
+} // namespace
+
+std::expected<std::string, std::error_code> readSmallFile(const std::filesystem::path& path, std::size_t limit)
+{
+    const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY | O_NONBLOCK));
+    struct stat status = {};
+    if (!file || ::fstat(file.get(), &status) != 0)
+        return systemError();
+    if (!S_ISREG(status.st_mode))
+        return std::unexpected(make_error_code(std::errc::invalid_argument));
+
+    // Files of /proc have no size, and any file may grow while it is read: only the end tells the length.
+    constexpr std::size_t smallestRead = 64;
+    std::string bytes;
+    for (std::size_t length = 0;;) {
+        bytes.resize(
+            std::min(limit + 1, length + std::max(smallestRead, static_cast<std::size_t>(status.st_size) + 1)));
+        const ssize_t count = ::read(file.get(), bytes.data() + length, bytes.size() - length);
+        if (count < 0 && errno != EINTR)
+            return systemError();
+        length += static_cast<std::size_t>(std::max<ssize_t>(count, 0));
+        if (length > limit)
+            return std::unexpected(make_error_code(std::errc::file_too_large));
+        if (count == 0) {
+            bytes.resize(length);
+            return bytes;
+        }
+    }
+}
+
+} // namespace platform

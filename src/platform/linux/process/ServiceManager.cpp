@@ -1,0 +1,14 @@
+// A notification that does not arrive harms nobody but the service manager, which has time-outs of its own: no failure
+// is looked for.
+#include "platform/linux/process/ServiceManager.h"
+
+#include <systemd/sd-daemon.h>
+
+namespace platform {
+
+void notifyReady(const std::string& status)
+{
+    ::sd_notifyf(0, "READY=1\nSTATUS=%s", status.c_str());
+}
+
+} // namespace platform

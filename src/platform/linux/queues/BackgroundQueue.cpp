@@ -1,0 +1,78 @@
+// One list for all threads; a thread is added only when more items wait than threads are free to take them, and
+// stays.
+#include "platform/linux/queues/BackgroundQueue.h"
+
+#include "platform/linux/process/Thread.h"
+
+#include <system_error>
+#include <utility>
+
+namespace platform {
+namespace {
+
+thread_local const BackgroundQueue* queueOfThisThread = nullptr;
+
+} // namespace
+
+BackgroundQueue::~BackgroundQueue()
+{
+    std::vector<std::thread> threads;
+    {
+        const foundation::Lock lock(lock_);
+        isEnding_ = true;
+        threads.swap(threads_);
+        changed_.notifyAll();
+    }
+    for (std::thread& thread : threads)
+        thread.join();
+    run(); // what there never was a thread for
+    queueOfThisThread = nullptr;
+}
+
+void BackgroundQueue::submit(WorkItem item)
+{
+    const foundation::Lock lock(lock_);
+    waiting_.push_back(std::move(item));
+    const bool isThreadWanted = freeThreads_ < waiting_.size() && threads_.size() < mostThreads && !isEnding_;
+    if (!isThreadWanted || !addThread())
+        changed_.notifyOne();
+}
+
+bool BackgroundQueue::addThread()
+{
+    try {
+        threads_.push_back(startThread("background", QualityOfService::Background, [this] { run(); }));
+        return true;
+    } catch (const std::system_error&) {
+        return false;
+    }
+}
+
+bool BackgroundQueue::isCurrent() const
+{
+    return queueOfThisThread == this;
+}
+
+void BackgroundQueue::run()
+{
+    queueOfThisThread = this;
+    while (WorkItem item = take())
+        item();
+}
+
+// The next item; an empty one when there will be none.
+WorkItem BackgroundQueue::take()
+{
+    const foundation::Lock lock(lock_);
+    ++freeThreads_;
+    while (waiting_.empty() && !isEnding_)
+        changed_.wait(lock_);
+    --freeThreads_;
+    if (waiting_.empty())
+        return nullptr;
+    WorkItem item = std::move(waiting_.front());
+    waiting_.pop_front();
+    return item;
+}
+
+} // namespace platform

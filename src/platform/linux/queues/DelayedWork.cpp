@@ -1,0 +1,65 @@
+// A schedule ordered by time; the thread wakes for its beginning only, and is woken only by what comes before that.
+#include "platform/linux/queues/DelayedWork.h"
+
+#include "platform/linux/process/Thread.h"
+
+#include <system_error>
+#include <utility>
+
+namespace platform {
+
+DelayedWork::~DelayedWork()
+{
+    std::thread thread;
+    {
+        const foundation::Lock lock(lock_);
+        isEnding_ = true;
+        thread.swap(thread_);
+        changed_.notifyOne();
+    }
+    if (thread.joinable())
+        thread.join();
+}
+
+void DelayedWork::add(Clock::time_point due, WorkQueue& queue, WorkItem item)
+{
+    const foundation::Lock lock(lock_);
+    const auto added = schedule_.emplace(due, Delayed{queue, std::move(item)});
+    if (!thread_.joinable())
+        static_cast<void>(start()); // if there is no thread to spare, the next item tries again
+    else if (added == schedule_.begin())
+        changed_.notifyOne();
+}
+
+bool DelayedWork::start()
+{
+    try {
+        thread_ = startThread("delayed work", QualityOfService::Default, [this] { run(); });
+        return true;
+    } catch (const std::system_error&) {
+        return false;
+    }
+}
+
+void DelayedWork::run()
+{
+    while (Schedule::node_type due = waitForDue())
+        due.mapped().queue.submit(std::move(due.mapped().item));
+}
+
+// Takes the next item when its time has come; an empty one when the work ends.
+DelayedWork::Schedule::node_type DelayedWork::waitForDue()
+{
+    const foundation::Lock lock(lock_);
+    while (!isEnding_) {
+        if (schedule_.empty())
+            changed_.wait(lock_);
+        else if (const auto next = schedule_.begin(); next->first <= Clock::now())
+            return schedule_.extract(next);
+        else
+            changed_.waitUntil(lock_, next->first);
+    }
+    return {};
+}
+
+} // namespace platform

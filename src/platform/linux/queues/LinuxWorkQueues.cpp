@@ -1,0 +1,60 @@
+// Only interactive queues have turns that end in something: other queues store nothing that a client waits for.
+#include "platform/linux/queues/LinuxWorkQueues.h"
+
+#include "foundation/Mutex.h"
+#include "platform/linux/queues/SerialQueue.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace platform {
+namespace {
+
+// Not std::counting_semaphore: that of GCC 12 may sleep through a signal.
+class LinuxSemaphore final : public Semaphore {
+public:
+    explicit LinuxSemaphore(unsigned count) : count_(count) { }
+
+    void signal() override
+    {
+        const foundation::Lock lock(lock_);
+        ++count_;
+        raised_.notifyOne();
+    }
+
+    void wait() override
+    {
+        const foundation::Lock lock(lock_);
+        while (count_ == 0)
+            raised_.wait(lock_);
+        --count_;
+    }
+
+private:
+    foundation::Mutex lock_;
+    foundation::Condition raised_;
+    unsigned count_ KESTO_GUARDED_BY(lock_);
+};
+
+} // namespace
+
+std::shared_ptr<WorkQueue> LinuxWorkQueues::makeSerialQueue(std::string_view name, QualityOfService quality)
+{
+    const bool hasTurns = quality == QualityOfService::UserInteractive;
+    return std::make_shared<SerialQueue>(name, quality, hasTurns ? turnEndHandler_ : nullptr);
+}
+
+void LinuxWorkQueues::submitAfter(std::chrono::nanoseconds delay, WorkQueue& queue, WorkItem item)
+{
+    using Clock = DelayedWork::Clock;
+    const Clock::time_point now = Clock::now();
+    const auto longest = Clock::time_point::max() - now;
+    delayedWork_.add(now + std::min<Clock::duration>(delay, longest), queue, std::move(item));
+}
+
+std::unique_ptr<Semaphore> LinuxWorkQueues::makeSemaphore(unsigned initialCount)
+{
+    return std::make_unique<LinuxSemaphore>(initialCount);
+}
+
+} // namespace platform

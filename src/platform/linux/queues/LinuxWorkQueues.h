@@ -1,0 +1,29 @@
+// The work queues of the process, on threads of their own.
+#pragma once
+
+#include "platform/linux/queues/BackgroundQueue.h"
+#include "platform/linux/queues/DelayedWork.h"
+
+#include <functional>
+
+namespace platform {
+
+// Any thread. Serial queues live as long as whoever made them wants, also longer than this.
+class LinuxWorkQueues final : public WorkQueues {
+public:
+    // Called on the queue's thread at the end of each turn of a serial queue whose quality is UserInteractive.
+    // Set before such a queue is made.
+    void setTurnEndHandler(std::function<void()> handler) { turnEndHandler_ = std::move(handler); }
+
+    [[nodiscard]] std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name, QualityOfService quality) override;
+    [[nodiscard]] WorkQueue& backgroundQueue() override { return backgroundQueue_; }
+    void submitAfter(std::chrono::nanoseconds delay, WorkQueue& queue, WorkItem item) override;
+    [[nodiscard]] std::unique_ptr<Semaphore> makeSemaphore(unsigned initialCount) override;
+
+private:
+    std::function<void()> turnEndHandler_;
+    BackgroundQueue backgroundQueue_;
+    DelayedWork delayedWork_; // ends first, for it feeds the other
+};
+
+} // namespace platform

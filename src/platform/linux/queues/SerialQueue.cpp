@@ -1,0 +1,197 @@
+// Who runs a turn takes it, and gives it back: queue's thread and helpers alike. All that they agree on is in three
+// flags under one lock.
+#include "platform/linux/queues/SerialQueue.h"
+
+#include "foundation/Mutex.h"
+#include "platform/linux/process/Thread.h"
+
+#include <cassert>
+#include <utility>
+#include <vector>
+
+namespace platform {
+
+class SerialQueue::Work : public std::enable_shared_from_this<Work> {
+public:
+    Work(std::function<void()> turnEndHandler, bool isInteractive)
+        : turnEndHandler_(std::move(turnEndHandler)),
+          isInteractive_(isInteractive)
+    {
+    }
+
+    void add(WorkItem item)
+    {
+        const bool mayHelp = isInteractive_ && thisThread.mayHelp(this);
+        if (mayHelp && thisThread.toHelp == nullptr)
+            thisThread.toHelp = shared_from_this();
+        const foundation::Lock lock(lock_);
+        waiting_.push_back(std::move(item));
+        const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith;
+        if (isAsleep_ && !isTurnTaken_ && !isLeftToHelper) {
+            isAsleep_ = false;
+            changed_.notifyOne(); // under the lock: once it is released, the item may do away with the queue
+        }
+    }
+
+    // Nothing is added any more, except by items.
+    void end()
+    {
+        const foundation::Lock lock(lock_);
+        isEnding_ = true;
+        changed_.notifyOne();
+    }
+
+    // The life of the queue's thread.
+    void run()
+    {
+        while (waitForTurn())
+            runTurn();
+    }
+
+    // Runs one turn on another thread, unless the queue's thread sees to it.
+    void help()
+    {
+        {
+            const foundation::Lock lock(lock_);
+            if (isTurnTaken_ || waiting_.empty() || waiting_.size() > mostItemsHelpedWith)
+                return;
+            takeTurn();
+        }
+        runTurn();
+    }
+
+    [[nodiscard]] bool isCurrent() const noexcept { return thisThread.runs == this; }
+    [[nodiscard]] static bool isTurnRunning() noexcept
+    {
+        return thisThread.runs != nullptr && thisThread.runs->turnEndHandler_ && !thisThread.isEndingTurn;
+    }
+
+    // What a thread has to do with serial queues.
+    struct ThisThread {
+        const Work* runs = nullptr;
+        bool isEndingTurn = false;
+        bool isHelper = false;
+        std::shared_ptr<Work> toHelp;
+
+        [[nodiscard]] bool mayHelp(const Work* work) const noexcept
+        {
+            return isHelper && runs == nullptr && (toHelp == nullptr || toHelp.get() == work);
+        }
+    };
+    static thread_local ThisThread thisThread;
+
+private:
+    static constexpr std::size_t mostRoomKept = 1024; // in items; what a burst needed beyond that is given back
+
+    // False when there will be none.
+    bool waitForTurn()
+    {
+        const foundation::Lock lock(lock_);
+        while (waiting_.empty() || isTurnTaken_) {
+            if (isEnding_ && !isTurnTaken_)
+                return false;
+            isAsleep_ = true;
+            changed_.wait(lock_);
+        }
+        isAsleep_ = false;
+        takeTurn();
+        return true;
+    }
+
+    void takeTurn() KESTO_REQUIRES(lock_)
+    {
+        isTurnTaken_ = true;
+        turn_.swap(waiting_);
+    }
+
+    void runTurn()
+    {
+        thisThread.runs = this;
+        for (WorkItem& item : turn_) {
+            item();
+            item = nullptr; // what it holds is released before the next one runs
+        }
+        turn_.clear();
+        if (turn_.capacity() > mostRoomKept)
+            turn_ = std::vector<WorkItem>();
+        if (turnEndHandler_) {
+            thisThread.isEndingTurn = true;
+            turnEndHandler_();
+            thisThread.isEndingTurn = false;
+        }
+        thisThread.runs = nullptr;
+        giveTurnBack();
+    }
+
+    void giveTurnBack()
+    {
+        const foundation::Lock lock(lock_);
+        isTurnTaken_ = false;
+        if (isAsleep_ && (isEnding_ || !waiting_.empty()))
+            changed_.notifyOne();
+    }
+
+    const std::function<void()> turnEndHandler_;
+    const bool isInteractive_;
+    foundation::Mutex lock_;
+    foundation::Condition changed_;
+    std::vector<WorkItem> waiting_ KESTO_GUARDED_BY(lock_);
+    std::vector<WorkItem> turn_; // of whoever has taken it
+    bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // somebody runs one
+    bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread, and nobody has woken it yet
+    bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
+};
+
+thread_local SerialQueue::Work::ThisThread SerialQueue::Work::thisThread;
+
+SerialQueue::SerialQueue(std::string_view name, QualityOfService quality, std::function<void()> turnEndHandler)
+    : work_(std::make_shared<Work>(std::move(turnEndHandler), quality == QualityOfService::UserInteractive)),
+      thread_(startThread(name, quality, [work = work_] { work->run(); }))
+{
+}
+
+SerialQueue::~SerialQueue()
+{
+    work_->end();
+    if (isCurrent())
+        thread_.detach();
+    else
+        thread_.join();
+}
+
+void SerialQueue::submit(WorkItem item)
+{
+    work_->add(std::move(item));
+}
+
+bool SerialQueue::isCurrent() const
+{
+    return work_->isCurrent();
+}
+
+bool SerialQueue::isTurnRunning() noexcept
+{
+    return Work::isTurnRunning();
+}
+
+SerialQueue::Helper::Helper()
+{
+    assert(!Work::thisThread.isHelper);
+    Work::thisThread.isHelper = true;
+    setQualityOfThisThread(QualityOfService::UserInteractive);
+}
+
+SerialQueue::Helper::~Helper()
+{
+    help();
+    Work::thisThread.isHelper = false;
+    setQualityOfThisThread(QualityOfService::Default);
+}
+
+void SerialQueue::Helper::help()
+{
+    if (const auto work = std::exchange(Work::thisThread.toHelp, nullptr))
+        work->help();
+}
+
+} // namespace platform

@@ -1,0 +1,20 @@
+// Device properties from device.toml in the configuration directory: a truth value a property.
+#pragma once
+
+#include "platform/DeviceProperties.h"
+#include "platform/linux/settings/WatchedTomlFile.h"
+
+namespace platform {
+
+// Any thread.
+class LinuxDeviceProperties final : public DeviceProperties {
+public:
+    LinuxDeviceProperties(ConfigurationWatcher& watcher, ProviderLog log) : file_(watcher, "device.toml", log) { }
+
+    [[nodiscard]] std::optional<bool> boolean(std::string_view name) const override;
+
+private:
+    WatchedTomlFile file_;
+};
+
+} // namespace platform

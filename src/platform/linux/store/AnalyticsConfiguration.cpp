@@ -1,0 +1,83 @@
+// Every key is read by itself, so that one wrong value costs its owner that one setting and a line which says what
+// belongs there.
+#include "platform/linux/store/AnalyticsConfiguration.h"
+
+#include <algorithm>
+#include <cmath>
+#include <fmt/format.h>
+#include <optional>
+#include <sqlite3.h>
+
+namespace platform {
+
+using foundation::Value;
+
+namespace {
+
+constexpr double mostMegabytes = 1024.0 * 1024;
+
+std::optional<std::vector<std::string>> stringsOf(const Value& value)
+{
+    const auto array = value.array();
+    if (!array || std::ranges::any_of(*array, [](const Value& each) { return each.kind() != Value::Kind::String; }))
+        return std::nullopt;
+    std::vector<std::string> strings;
+    for (const Value& each : *array)
+        strings.push_back(each.text());
+    return strings;
+}
+
+std::optional<double> positiveNumberOf(const Value& value)
+{
+    const auto number = value.number();
+    const bool isNumber = number && number->kind() != foundation::Number::Kind::Boolean;
+    return isNumber && number->doubleValue() > 0 ? std::optional(number->doubleValue()) : std::nullopt;
+}
+
+// Puts a value in its place, or returns what should stand there instead.
+std::string_view read(std::string_view key, const Value& value, AnalyticsConfiguration& configuration)
+{
+    if (key == "used") {
+        auto strings = stringsOf(value);
+        if (!strings)
+            return "a list of patterns such as [\"com.quarn.*\"]";
+        configuration.used = std::move(*strings);
+    } else if (key == "maximum_age_days") {
+        const auto days = positiveNumberOf(value);
+        if (!days)
+            return "a number of days above 0";
+        configuration.maximumAgeDays = *days;
+    } else if (key == "maximum_size_mb") {
+        const auto megabytes = positiveNumberOf(value);
+        if (!megabytes || *megabytes < 1 || *megabytes > mostMegabytes)
+            return "a number of megabytes from 1 to 1048576";
+        configuration.maximumSizeMegabytes = static_cast<std::uint64_t>(*megabytes);
+    } else if (key == "synchronous") {
+        if (value != Value("normal") && value != Value("full"))
+            return "\"normal\" or \"full\"";
+        configuration.synchronization =
+            value == Value("full") ? StoreSynchronization::Full : StoreSynchronization::Normal;
+    } else {
+        return "nothing: the keys are used, maximum_age_days, maximum_size_mb and synchronous";
+    }
+    return {};
+}
+
+} // namespace
+
+CheckedAnalyticsConfiguration readAnalyticsConfiguration(const foundation::Dictionary& values)
+{
+    CheckedAnalyticsConfiguration checked;
+    for (const auto& [key, value] : values)
+        if (const auto expected = read(key, value, checked.configuration); !expected.empty())
+            checked.problems.push_back(fmt::format("{} = {} should be {}", key.view(), value.text(), expected));
+    return checked;
+}
+
+bool matchesAny(const std::vector<std::string>& globs, const std::string& name)
+{
+    return std::ranges::any_of(
+        globs, [&name](const std::string& glob) { return ::sqlite3_strglob(glob.c_str(), name.c_str()) == 0; });
+}
+
+} // namespace platform

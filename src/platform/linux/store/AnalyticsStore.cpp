@@ -1,0 +1,214 @@
+// Batches of events between those who send them and the thread that writes them.
+#include "platform/linux/store/AnalyticsStore.h"
+
+#include "platform/linux/process/Thread.h"
+#include "platform/linux/queues/SerialQueue.h"
+
+#include <future>
+#include <iterator>
+#include <utility>
+
+namespace platform {
+
+namespace {
+constexpr std::size_t mostRoomKept = 1024; // in turns that wait; what a burst needed beyond that is given back
+}
+
+// --- Batches
+
+void AnalyticsStore::Batch::takeFrom(Batch& other)
+{
+    events.takeFrom(other.events);
+    std::ranges::move(other.whenKept, std::back_inserter(whenKept));
+    other.clear();
+}
+
+void AnalyticsStore::Batch::clear()
+{
+    events.clear();
+    whenKept.clear();
+    if (whenKept.capacity() > mostRoomKept)
+        whenKept = std::vector<WhenKept>();
+}
+
+bool AnalyticsStore::isRoomIn(const Batch& batch) const noexcept
+{
+    return batch.events.size() + batch.whenKept.size() < limits_.mostEvents && batch.events.bytes() < limits_.mostBytes;
+}
+
+// --- What others call
+
+AnalyticsStore::AnalyticsStore(const std::filesystem::path& stateDirectory, ConfigurationWatcher& watcher,
+                               const Clock& clock, ProviderLog log, Limits limits)
+    : clock_(clock),
+      log_(log),
+      limits_(limits),
+      writer_(stateDirectory, clock, log),
+      configurationFile_(watcher, "analytics.toml", log, [this] { applyConfiguration(); })
+{
+    applyConfiguration();
+    thread_ = startThread("analytics", QualityOfService::Default, [this] { run(); });
+}
+
+AnalyticsStore::~AnalyticsStore()
+{
+    {
+        const foundation::Lock lock(lock_);
+        waiting_.takeFrom(turn_);
+        isEnding_ = true;
+        wakeWriter();
+    }
+    thread_.join();
+}
+
+void AnalyticsStore::sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder)
+{
+    if (!isAnalyticsEventUsed(eventName)) // of those that ask before, this costs little
+        return;
+    const double time = clock_.secondsSince1970();
+    const foundation::Dictionary payload = payloadBuilder();
+    const foundation::Lock lock(lock_);
+    if (SerialQueue::isTurnRunning()) {
+        turn_.events.add(time, eventName, payload);
+        if (isRoomIn(turn_))
+            return;
+        waiting_.takeFrom(turn_); // a turn that is too large is written in parts
+    } else {
+        waiting_.events.add(time, eventName, payload);
+    }
+    wakeWriter();
+    waitForRoom();
+}
+
+void AnalyticsStore::endTurn(WhenKept whenKept)
+{
+    {
+        const foundation::Lock lock(lock_);
+        if (!isEverythingKept()) {
+            waiting_.takeFrom(turn_);
+            if (whenKept)
+                waiting_.whenKept.push_back(std::move(whenKept));
+            wakeWriter();
+            waitForRoom();
+            return;
+        }
+    }
+    if (whenKept)
+        whenKept();
+}
+
+void AnalyticsStore::flush()
+{
+    std::promise<void> kept;
+    {
+        const foundation::Lock lock(lock_);
+        if (isEverythingKept())
+            return;
+        waiting_.takeFrom(turn_);
+        waiting_.whenKept.emplace_back([&kept] { kept.set_value(); });
+        wakeWriter();
+    }
+    kept.get_future().wait();
+}
+
+// --- Between them and the store's thread
+
+// Reads the values anew, so that whoever comes last applies the last.
+void AnalyticsStore::applyConfiguration()
+{
+    std::vector<std::string> problems;
+    {
+        const foundation::Lock lock(lock_);
+        auto checked = readAnalyticsConfiguration(configurationFile_.values());
+        names_.setPatterns(checked.configuration.used);
+        newConfiguration_ = std::move(checked.configuration);
+        problems = std::move(checked.problems);
+        wakeWriter();
+    }
+    for (const std::string& problem : problems)
+        log_.error("{}: {}; the default counts until this is corrected", configurationFile_.path().native(), problem);
+}
+
+bool AnalyticsStore::isEverythingKept() const
+{
+    return turn_.empty() && waiting_.empty() && !isWriting_;
+}
+
+void AnalyticsStore::wakeWriter()
+{
+    if (std::exchange(isAsleep_, false))
+        changed_.notifyOne();
+}
+
+void AnalyticsStore::waitForRoom()
+{
+    while (!isRoomIn(waiting_))
+        room_.wait(lock_);
+}
+
+// --- The store's thread
+
+void AnalyticsStore::run()
+{
+    Batch batch;
+    for (bool isFirst = true; take(batch); isFirst = false) {
+        if (isFirst)
+            writer_.open();
+        const bool isQuiet = batch.empty();
+        writer_.keep(batch.events);
+        for (WhenKept& whenKept : batch.whenKept)
+            whenKept();
+        finish();
+        batch.clear();
+        while (writer_.maintain(isQuiet) && isIdle()) { }
+    }
+}
+
+// Waits for something to write, or to do, and takes all of it; false at the end.
+bool AnalyticsStore::take(Batch& batch)
+{
+    std::optional<AnalyticsConfiguration> configuration;
+    {
+        const foundation::Lock lock(lock_);
+        while (waiting_.empty() && !newConfiguration_) {
+            if (isEnding_)
+                return false;
+            if (!sleep())
+                break; // with nothing, in a quiet moment
+        }
+        std::swap(configuration, newConfiguration_);
+        std::swap(batch, waiting_);
+        isWriting_ = !batch.empty();
+        room_.notifyAll();
+    }
+    if (configuration)
+        writer_.setConfiguration(*configuration);
+    return true;
+}
+
+// False when it became quiet and that was waited for.
+bool AnalyticsStore::sleep()
+{
+    bool isQuiet = false;
+    isAsleep_ = true;
+    if (!writer_.awaitsQuiet())
+        changed_.wait(lock_);
+    else
+        isQuiet = changed_.waitUntil(lock_, std::chrono::steady_clock::now() + quietTime) == std::cv_status::timeout;
+    isAsleep_ = false;
+    return !isQuiet;
+}
+
+void AnalyticsStore::finish()
+{
+    const foundation::Lock lock(lock_);
+    isWriting_ = false;
+}
+
+bool AnalyticsStore::isIdle()
+{
+    const foundation::Lock lock(lock_);
+    return waiting_.empty() && !newConfiguration_ && !isEnding_;
+}
+
+} // namespace platform

@@ -1,0 +1,66 @@
+// Events on their way to the database, written out as they will stand there.
+//
+// A payload becomes JSON when its event is added, on the thread that built it: taken apart on the store's thread, every
+// string that it shares with other messages would wander between two processors. Only a large payload waits for the
+// store's thread, because clients wait for the one that adds it.
+#pragma once
+
+#include "foundation/values/Value.h"
+#include "platform/linux/store/EventDatabase.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <span>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace platform {
+
+// One thread at a time.
+class EventBatch {
+public:
+    // A payload that takes more, roughly, waits.
+    static constexpr std::size_t largestWrittenAtOnce = 64 * 1024;
+
+    // The time is in seconds since 1970 UTC.
+    void add(double time, std::string_view name, const foundation::Dictionary& payload);
+    // Puts the events of the other behind these; it is then empty.
+    void takeFrom(EventBatch& other);
+    void clear();
+
+    // How many events were added, and how many bytes they take, roughly.
+    [[nodiscard]] std::size_t size() const noexcept { return events_.size(); }
+    [[nodiscard]] std::size_t bytes() const noexcept;
+
+    // The events in their order, without those whose payload holds what JSON cannot say. Valid until the batch
+    // changes.
+    [[nodiscard]] std::span<const EventRow> rows();
+
+private:
+    struct Text { // in `texts_`
+        std::size_t begin = 0;
+        std::size_t size = 0;
+    };
+    struct Event {
+        double time;
+        Text name;
+        std::size_t payload; // its place in `payloads_`
+    };
+    struct Payload {
+        Text json; // empty where there is none
+        foundation::Dictionary waiting; // to become JSON
+    };
+
+    [[nodiscard]] Text write(const foundation::Dictionary& payload);
+    [[nodiscard]] std::string_view view(const Text& text) const;
+
+    std::vector<Event> events_;
+    std::vector<Payload> payloads_;
+    foundation::Dictionary lastPayload_; // both events of a message share one
+    std::string texts_;
+    std::size_t waitingBytes_ = 0;
+    std::vector<EventRow> rows_;
+};
+
+} // namespace platform

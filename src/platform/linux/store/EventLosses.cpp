@@ -1,0 +1,40 @@
+// What was counted and not told yet is told at the end at the latest: no loss goes unsaid because the service went
+// first.
+#include "platform/linux/store/EventLosses.h"
+
+namespace platform {
+
+EventLosses::~EventLosses()
+{
+    for (std::size_t reason = 0; reason < storeErrorCount; ++reason)
+        if (losses_[reason].told < losses_[reason].events)
+            tell(static_cast<StoreError>(reason), losses_[reason]);
+}
+
+void EventLosses::add(StoreError reason, std::uint64_t events)
+{
+    losses_[static_cast<std::size_t>(reason)].events += events;
+}
+
+void EventLosses::report()
+{
+    const double now = clock_.systemUptime();
+    for (std::size_t reason = 0; reason < storeErrorCount; ++reason) {
+        Loss& loss = losses_[reason];
+        const bool isDue = loss.told == 0 || now - loss.toldAt >= secondsBetweenLines;
+        if (loss.told < loss.events && isDue)
+            tell(static_cast<StoreError>(reason), loss);
+    }
+}
+
+void EventLosses::tell(StoreError reason, Loss& loss)
+{
+    const auto [problem, remedy] = words(reason);
+    const std::uint64_t events = loss.events;
+    log_.error("{} analytics events were lost ({} since the start): {}: {}; {}", events - loss.told, events,
+               path_.native(), problem, remedy);
+    loss.told = events;
+    loss.toldAt = clock_.systemUptime();
+}
+
+} // namespace platform

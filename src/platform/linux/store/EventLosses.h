@@ -1,0 +1,58 @@
+// Counts the events that could not be kept, by reason, and tells the owner: at the first loss of a kind, and then
+// once a minute while it lasts, so that a full disk does not fill up the log as well.
+#pragma once
+
+#include "platform/Clock.h"
+#include "platform/linux/log/ProviderLog.h"
+#include "platform/linux/store/StoreError.h"
+
+#include <array>
+#include <atomic>
+#include <cstdint>
+#include <filesystem>
+
+namespace platform {
+
+// One thread, but for `count`.
+class EventLosses {
+public:
+    static constexpr double secondsBetweenLines = 60;
+
+    // The path is that of the database, for the log.
+    EventLosses(std::filesystem::path path, const Clock& clock, ProviderLog log)
+        : path_(std::move(path)),
+          clock_(clock),
+          log_(log)
+    {
+    }
+    // Tells what has not been told.
+    ~EventLosses();
+    EventLosses(const EventLosses&) = delete;
+    EventLosses& operator=(const EventLosses&) = delete;
+
+    void add(StoreError reason, std::uint64_t events);
+    // Tells what has not been told, of each reason that was not told of within the last minute.
+    void report();
+
+    // How many were lost for that reason since the start. Any thread.
+    [[nodiscard]] std::uint64_t count(StoreError reason) const noexcept
+    {
+        return losses_[static_cast<std::size_t>(reason)].events;
+    }
+
+private:
+    struct Loss {
+        std::atomic<std::uint64_t> events = 0;
+        std::uint64_t told = 0;
+        double toldAt = 0; // uptime, in seconds
+    };
+
+    void tell(StoreError reason, Loss& loss);
+
+    const std::filesystem::path path_;
+    const Clock& clock_;
+    const ProviderLog log_;
+    std::array<Loss, storeErrorCount> losses_;
+};
+
+} // namespace platform

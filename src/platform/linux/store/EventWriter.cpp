@@ -1,0 +1,273 @@
+// What to do when the database cannot do what it should: try again later, set it aside, or count the loss. Nothing
+// here gives up for good.
+#include "platform/linux/store/EventWriter.h"
+
+#include <algorithm>
+#include <array>
+#include <fmt/chrono.h>
+#include <set>
+#include <system_error>
+#include <utility>
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr std::uint64_t bytesOfARow = 24; // beside its texts, roughly
+constexpr std::uint64_t bytesTidiedAtOnce = 1024 * 1024;
+constexpr double secondsADay = 86400;
+
+fs::path withSuffix(const fs::path& path, std::string_view suffix)
+{
+    return fs::path(path).concat(suffix);
+}
+
+constexpr std::string_view damagedMark = ".corrupt-";
+constexpr std::string_view newerMark = ".newer-";
+
+// What SQLite has beside a database, under the same name and these ends.
+constexpr std::array<std::string_view, 2> companions = {"-wal", "-shm"};
+
+} // namespace
+
+EventWriter::EventWriter(const fs::path& directory, const Clock& clock, ProviderLog log)
+    : path_(directory / fileName),
+      clock_(clock),
+      log_(log),
+      losses_(path_, clock, log)
+{
+}
+
+void EventWriter::setConfiguration(const AnalyticsConfiguration& configuration)
+{
+    configuration_ = configuration;
+    hasMoreToTidy_ = true; // perhaps
+    if (database_)
+        if (const auto done = database_->setSynchronization(configuration_.synchronization); !done)
+            handleFailure(done.error());
+}
+
+std::uint64_t EventWriter::maximumBytes() const noexcept
+{
+    return configuration_.maximumSizeMegabytes * 1024 * 1024;
+}
+
+// --- Opening
+
+void EventWriter::open()
+{
+    if (const auto done = ensureOpen(); !done) {
+        const auto [problem, remedy] = words(done.error());
+        log_.error("analytics events cannot be kept: {}: {}; {}", path_.native(), problem, remedy);
+    }
+}
+
+EventWriter::Expected<> EventWriter::ensureOpen()
+{
+    if (database_ && !database_->wasReplaced())
+        return {};
+    if (database_) {
+        log_.error("{} was taken away; events are kept in the one that is there now, or in a new one", path_.native());
+        database_.reset();
+    } else if (clock_.systemUptime() < openAgainAt_) {
+        return std::unexpected(openError_);
+    }
+    const auto done = openAnew();
+    if (!done) {
+        openError_ = done.error();
+        openAgainAt_ = clock_.systemUptime() + secondsBetweenOpenings;
+    }
+    return done;
+}
+
+EventWriter::Expected<> EventWriter::openAnew()
+{
+    auto opened = EventDatabase::open(path_);
+    if (!opened && (opened.error() == StoreError::Corrupt || opened.error() == StoreError::Newer)
+        && setAside(opened.error()))
+        opened = EventDatabase::open(path_);
+    if (!opened)
+        return std::unexpected(opened.error());
+    database_ = std::move(*opened);
+    logBytesAtCheckpoint_ = 0;
+    return database_->setSynchronization(configuration_.synchronization);
+}
+
+// Renames the database, which is closed. One that is newer is good, and is never removed.
+bool EventWriter::setAside(StoreError reason)
+{
+    const bool isNewer = reason == StoreError::Newer;
+    if (!isNewer)
+        removeOldestDamaged();
+    const auto now = static_cast<std::time_t>(clock_.secondsSince1970());
+    const fs::path wanted =
+        withSuffix(path_, fmt::format("{}{:%Y%m%dT%H%M%SZ}", isNewer ? newerMark : damagedMark, fmt::gmtime(now)));
+    fs::path target = wanted;
+    std::error_code error;
+    for (int number = 2; fs::exists(target, error); ++number)
+        target = withSuffix(wanted, fmt::format(".{}", number));
+
+    fs::rename(path_, target, error);
+    if (error)
+        return false;
+    for (const std::string_view suffix : companions) {
+        std::error_code isNotThere;
+        fs::rename(withSuffix(path_, suffix), withSuffix(target, suffix), isNotThere);
+    }
+    log_.error("{} {}; it is now {}, and a new one is begun", path_.native(),
+               isNewer ? "was made by a later version of the service" : "is damaged or no database of events",
+               target.native());
+    return true;
+}
+
+void EventWriter::removeOldestDamaged()
+{
+    std::set<fs::path> damaged; // oldest first, for the time is in the name
+    std::error_code error;
+    for (fs::directory_iterator file(path_.parent_path(), error); file != end(file); file.increment(error)) {
+        const std::string name = file->path().filename();
+        const auto isCompanion = [&name](std::string_view suffix) { return name.ends_with(suffix); };
+        if (name.starts_with(fmt::format("{}{}", fileName, damagedMark))
+            && std::ranges::none_of(companions, isCompanion))
+            damaged.insert(file->path());
+    }
+    for (; damaged.size() >= mostDamagedKept; damaged.erase(damaged.begin())) {
+        fs::remove(*damaged.begin(), error);
+        for (const std::string_view suffix : companions)
+            fs::remove(withSuffix(*damaged.begin(), suffix), error);
+    }
+}
+
+// --- Keeping
+
+void EventWriter::keep(EventBatch& events)
+{
+    if (events.size() == 0)
+        return;
+    const auto rows = events.rows();
+    losses_.add(StoreError::NotJson, events.size() - rows.size());
+    auto done = write(rows);
+    if (!done && done.error() == StoreError::Corrupt)
+        done = write(rows); // into the new one
+    if (done)
+        kept_ += rows.size();
+    else
+        losses_.add(done.error(), rows.size());
+    losses_.report();
+}
+
+EventWriter::Expected<> EventWriter::write(std::span<const EventRow> rows)
+{
+    const auto writeAll = [&]() -> Expected<> {
+        if (const auto done = ensureOpen(); !done)
+            return done;
+        if (database_->logBytes() > maximumBytes() && !emptyLog())
+            return std::unexpected(StoreError::LogHeld);
+        if (const auto done = database_->begin(); !done)
+            return done;
+        if (const auto done = database_->insert(rows); !done)
+            return done;
+        return database_->commit();
+    };
+    const auto done = writeAll();
+    if (!done) {
+        handleFailure(done.error());
+        return done;
+    }
+    for (const EventRow& row : rows)
+        bytesSinceCheck_ += bytesOfARow + row.name.size() + row.payload.size();
+    return done;
+}
+
+void EventWriter::handleFailure(StoreError error)
+{
+    if (database_)
+        database_->rollBack();
+    if (error == StoreError::DiskFull || error == StoreError::Locked || error == StoreError::LogHeld)
+        return; // the connection is as good as before
+    const bool wasOpen = database_ != nullptr;
+    database_.reset();
+    if (error == StoreError::Corrupt && wasOpen)
+        setAside(error); // where that fails, the next opening finds it damaged again
+}
+
+// --- Housekeeping
+
+bool EventWriter::awaitsQuiet() const
+{
+    return database_ && isLogLongerBy(logBytesBetweenCheckpoints);
+}
+
+bool EventWriter::maintain(bool isQuiet)
+{
+    losses_.report();
+    if (!database_)
+        return false;
+    if (database_->logBytes() < logBytesAtCheckpoint_)
+        logBytesAtCheckpoint_ = 0; // it began anew
+    if (isLogLongerBy(isQuiet ? logBytesBetweenCheckpoints : mostLogBytesBetweenCheckpoints))
+        emptyLog();
+    const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
+        || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
+    hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && tidy(); // tidying makes the log longer
+    return hasMoreToTidy_;
+}
+
+// Than at the last checkpoint.
+bool EventWriter::isLogLongerBy(std::uint64_t bytes) const
+{
+    return database_->logBytes() >= logBytesAtCheckpoint_ + std::min(bytes, maximumBytes() / 4);
+}
+
+bool EventWriter::emptyLog()
+{
+    const double now = clock_.systemUptime();
+    const bool waits = database_->logBytes() > maximumBytes() / 2 && now >= waitForReadersAt_;
+    const bool isEmpty = database_->emptyLog(waits ? waitForReaders : std::chrono::milliseconds());
+    if (waits && !isEmpty)
+        waitForReadersAt_ = now + secondsBetweenWaits;
+    logBytesAtCheckpoint_ = database_->logBytes();
+    return isEmpty;
+}
+
+// Makes more room than was taken since the last time, so that it keeps up, but not all of it at once. True when more
+// is left to do.
+bool EventWriter::tidy()
+{
+    const std::uint64_t mostFreed = 2 * std::exchange(bytesSinceCheck_, 0) + bytesTidiedAtOnce;
+    checkedAt_ = clock_.systemUptime();
+    // Deleting turns used room into free room, and shrinking free room into none.
+    const auto room = [](const EventDatabase::Size& size) { return 2 * size.usedBytes + size.freeBytes; };
+    auto size = database_->size();
+    const std::uint64_t roomBefore = size ? room(*size) : 0;
+    while (size && room(*size) + mostFreed > roomBefore) {
+        const auto hasMore = tidySome(*size);
+        if (hasMore && !*hasMore)
+            return false;
+        size = hasMore ? database_->size() : std::unexpected(hasMore.error());
+    }
+    if (!size)
+        handleFailure(size.error());
+    return size.has_value();
+}
+
+// False when nothing is left to do.
+EventWriter::Expected<bool> EventWriter::tidySome(const EventDatabase::Size& size)
+{
+    const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
+    const auto deleted = size.usedBytes > maximumBytes()
+        ? database_->deleteOldest(size.usedBytes - maximumBytes(), eventsDeletedAtOnce)
+        : database_->deleteBefore(tooOld, eventsDeletedAtOnce);
+    if (!deleted)
+        return std::unexpected(deleted.error());
+    // New events fill what old ones left free; the file shrinks only where far too much is free.
+    const bool isFileTooLarge = size.usedBytes + size.freeBytes > maximumBytes() + maximumBytes() / 8;
+    if (*deleted > 0 || !isFileTooLarge || size.freeBytes == 0)
+        return *deleted > 0;
+    if (const auto done = database_->shrink(bytesTidiedAtOnce); !done)
+        return std::unexpected(done.error());
+    return true;
+}
+
+} // namespace platform

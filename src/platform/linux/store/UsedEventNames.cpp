@@ -1,0 +1,56 @@
+// Names repeat and patterns rarely change: each thread remembers what it was told, and under which patterns.
+#include "platform/linux/store/UsedEventNames.h"
+
+#include "platform/linux/store/AnalyticsConfiguration.h"
+
+#include <array>
+#include <cstdint>
+#include <functional>
+
+namespace platform {
+namespace {
+
+struct Answer {
+    std::uint64_t version = 0;
+    std::string name;
+    bool isUsed = false;
+};
+
+// Where the answer about a name is, if it was not driven away by another name.
+Answer& rememberedAnswer(std::string_view name)
+{
+    thread_local std::array<Answer, UsedEventNames::answersRemembered> answers;
+    return answers[std::hash<std::string_view>()(name) % answers.size()];
+}
+
+// One that was never there before, in this process.
+std::uint64_t newVersion()
+{
+    static std::atomic<std::uint64_t> last = 0;
+    return ++last;
+}
+
+} // namespace
+
+UsedEventNames::UsedEventNames() : version_(newVersion()) { }
+
+void UsedEventNames::setPatterns(std::vector<std::string> patterns)
+{
+    const foundation::Lock lock(lock_);
+    patterns_ = std::move(patterns);
+    version_ = newVersion();
+}
+
+bool UsedEventNames::contains(std::string_view name)
+{
+    Answer& answer = rememberedAnswer(name);
+    if (answer.version != version_ || answer.name != name) {
+        std::string copy(name);
+        const foundation::Lock lock(lock_);
+        const bool isUsed = matchesAny(patterns_, copy);
+        answer = {version_, std::move(copy), isUsed};
+    }
+    return answer.isUsed;
+}
+
+} // namespace platform

@@ -1,0 +1,87 @@
+// The page is a sealed memory file: the service maps it for writing first, and the seal then forbids that to
+// everybody who comes later. Nobody is answered under the lock.
+#include "platform/linux/trace/TraceMarkerAccess.h"
+
+#include "platform/linux/trace/TraceMarker.h"
+
+#include <atomic>
+#include <cassert>
+#include <cerrno>
+#include <fcntl.h>
+#include <sys/mman.h>
+#include <utility>
+
+namespace platform {
+namespace {
+
+std::error_code systemError()
+{
+    return {errno, std::generic_category()};
+}
+
+} // namespace
+
+TraceMarkerAccess::~TraceMarkerAccess()
+{
+    const foundation::Lock lock(lock_);
+    if (mapping_ != nullptr)
+        ::munmap(mapping_, TraceMarkerPage::size);
+}
+
+void TraceMarkerAccess::ask(const void* asker, Answer answer)
+{
+    TraceDescriptors descriptors;
+    {
+        const foundation::Lock lock(lock_);
+        if (!descriptors_) {
+            waiting_.insert_or_assign(asker, std::move(answer));
+            return;
+        }
+        descriptors = *descriptors_;
+    }
+    answer(descriptors);
+}
+
+void TraceMarkerAccess::forget(const void* asker)
+{
+    const foundation::Lock lock(lock_);
+    waiting_.erase(asker);
+}
+
+// The service's own mapping is made before the seal that forbids all later ones to write.
+std::error_code TraceMarkerAccess::open(int marker)
+{
+    constexpr int seals = F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_FUTURE_WRITE | F_SEAL_SEAL;
+    std::map<const void*, Answer> waiting;
+    TraceDescriptors descriptors;
+    {
+        const foundation::Lock lock(lock_);
+        assert(!descriptors_);
+        FileDescriptor page(::memfd_create("kesto-trace", MFD_CLOEXEC | MFD_ALLOW_SEALING));
+        if (!page || ::ftruncate(page.get(), TraceMarkerPage::size) != 0)
+            return systemError();
+        void* const mapping = ::mmap(nullptr, TraceMarkerPage::size, PROT_READ | PROT_WRITE, MAP_SHARED, page.get(), 0);
+        if (mapping == MAP_FAILED)
+            return systemError();
+        mapping_ = mapping;
+        if (::fcntl(page.get(), F_ADD_SEALS, seals) != 0)
+            return systemError();
+        page_ = std::move(page);
+        descriptors = {.marker = marker, .page = page_.get()};
+        descriptors_ = descriptors;
+        waiting = std::exchange(waiting_, {});
+    }
+    for (auto& [asker, answer] : waiting)
+        answer(descriptors);
+    return {};
+}
+
+void TraceMarkerAccess::setTracing(bool isTracing) noexcept
+{
+    const foundation::Lock lock(lock_);
+    if (descriptors_)
+        std::atomic_ref(static_cast<TraceMarkerPage*>(mapping_)->isTracing)
+            .store(isTracing ? 1 : 0, std::memory_order_release);
+}
+
+} // namespace platform

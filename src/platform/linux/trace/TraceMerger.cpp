@@ -1,0 +1,106 @@
+// Processors are streams that are in order by themselves, so that ordering all of them is merging neighbours: as
+// good as nothing where one processor does all the work.
+#include "platform/linux/trace/TraceMerger.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace platform {
+namespace {
+
+// A record: the kernel's type (2 bytes) and thread (4), then what was written to the marker.
+constexpr std::size_t threadOffset = 4;
+constexpr std::size_t markerOffset = 8;
+constexpr std::size_t recordSize = markerOffset + sizeof(TraceMarkerRecord);
+
+template <typename Number> Number numberAt(std::span<const std::byte> bytes, std::size_t offset)
+{
+    Number number{};
+    std::memcpy(&number, bytes.data() + offset, sizeof number);
+    return number;
+}
+
+bool isBefore(const TracedMarker& left, const TracedMarker& right)
+{
+    return left.timestamp < right.timestamp;
+}
+
+} // namespace
+
+bool TraceMerger::isMarker(std::span<const std::byte> record) const noexcept
+{
+    return record.size() == recordSize && numberAt<std::uint16_t>(record, 0) == recordType_
+        && numberAt<std::uint32_t>(record, markerOffset) == TraceMarkerRecord::ownTag;
+}
+
+void TraceMerger::take(std::uint32_t cpu, std::span<const std::byte> page)
+{
+    if (cpu >= streams_.size())
+        streams_.resize(cpu + 1);
+    TracePageReader reader(page, format_);
+    losses_ += reader.missedEvents();
+    while (const auto record = reader.next())
+        if (isMarker(record->bytes))
+            add(streams_[cpu], cpu, *record);
+    losses_ += reader.isBroken() ? 1 : 0;
+}
+
+void TraceMerger::add(std::vector<TracedMarker>& stream, std::uint32_t cpu, const TraceRecord& record)
+{
+    const bool isLate =
+        record.timestamp <= doneUpTo_ || (!stream.empty() && record.timestamp < stream.back().timestamp);
+    if (isLate || waiting_ == mostWaiting) {
+        ++losses_;
+        return;
+    }
+    ++waiting_;
+    TracedMarker& event = stream.emplace_back();
+    event.timestamp = record.timestamp;
+    event.threadID = numberAt<std::uint32_t>(record.bytes, threadOffset);
+    event.cpu = cpu;
+    event.record = numberAt<TraceMarkerRecord>(record.bytes, markerOffset);
+}
+
+std::span<const TracedMarker> TraceMerger::eventsUpTo(std::uint64_t time)
+{
+    doneUpTo_ = std::max(doneUpTo_, time);
+    merged_.clear();
+    runs_.assign(1, 0);
+    for (auto& stream : streams_) {
+        const auto end = std::ranges::upper_bound(stream, doneUpTo_, {}, &TracedMarker::timestamp);
+        if (end == stream.begin())
+            continue;
+        merged_.insert(merged_.end(), stream.begin(), end);
+        stream.erase(stream.begin(), end);
+        runs_.push_back(merged_.size());
+    }
+    waiting_ -= merged_.size();
+    while (runs_.size() > 2)
+        mergeNeighbours();
+    return merged_;
+}
+
+// Half as many runs; one without a neighbour stays as it is.
+void TraceMerger::mergeNeighbours()
+{
+    merging_.resize(merged_.size());
+    const auto at = [](auto& events, std::size_t index) { return events.begin() + static_cast<std::ptrdiff_t>(index); };
+    std::size_t kept = 1;
+    for (std::size_t run = 0; run + 1 < runs_.size(); run += 2) {
+        const std::size_t begin = runs_[run];
+        const std::size_t middle = runs_[run + 1];
+        const std::size_t end = runs_[std::min(run + 2, runs_.size() - 1)];
+        std::merge(at(merged_, begin), at(merged_, middle), at(merged_, middle), at(merged_, end), at(merging_, begin),
+                   isBefore);
+        runs_[kept++] = end;
+    }
+    runs_.resize(kept);
+    merged_.swap(merging_);
+}
+
+std::uint64_t TraceMerger::takeLosses() noexcept
+{
+    return std::exchange(losses_, 0);
+}
+
+} // namespace platform

@@ -1,0 +1,87 @@
+// Every length is held against what is left before it is believed; the first that does not fit ends the page, for
+// nothing behind it can be told apart any more.
+#include "platform/linux/trace/TracePage.h"
+
+namespace platform {
+namespace {
+
+// The number of bytes that were committed has flags in its upper bits.
+constexpr std::uint32_t committedBytes = 0xFFFFF;
+constexpr std::uint32_t missedAreCounted = 1U << 30;
+constexpr std::uint32_t areMissed = 1U << 31;
+
+// A number of 4 or 8 bytes.
+std::uint64_t numberAt(std::span<const std::byte> bytes, std::size_t offset, std::size_t size)
+{
+    std::uint64_t number = 0;
+    std::uint32_t half = 0;
+    if (size == sizeof number)
+        std::memcpy(&number, bytes.data() + offset, sizeof number);
+    else
+        std::memcpy(&half, bytes.data() + offset, sizeof half);
+    return size == sizeof number ? number : half;
+}
+
+} // namespace
+
+TracePageReader::TracePageReader(std::span<const std::byte> page, const TracePageFormat& format)
+{
+    if (page.size() < format.dataOffset) {
+        isBroken_ = true;
+        return;
+    }
+    time_ = numberAt(page, 0, sizeof time_);
+    const std::uint64_t commit = numberAt(page, TracePageFormat::commitOffset, format.commitSize);
+    const std::span<const std::byte> data = page.subspan(format.dataOffset);
+    const std::size_t size = commit & committedBytes;
+    if (size > data.size()) {
+        isBroken_ = true;
+        return;
+    }
+    rest_ = data.first(size);
+    if ((commit & areMissed) == 0)
+        return;
+    const bool isCounted = (commit & missedAreCounted) != 0 && data.size() - size >= format.commitSize;
+    missedEvents_ = isCounted ? numberAt(data, size, format.commitSize) : 1;
+}
+
+// A record of more than 28 words has its length, that of the length itself included, in a word of its own.
+std::optional<TraceRecord> TracePageReader::takeLongRecord() noexcept
+{
+    if (!holds(2))
+        return std::nullopt;
+    const std::uint32_t length = word(1);
+    if (length < wordSize) {
+        isBroken_ = true;
+        return std::nullopt;
+    }
+    return takeRecord(2 * wordSize, length - wordSize);
+}
+
+// Without a time, nothing but padding follows; with one, it stands where an event was taken back.
+void TracePageReader::skipPadding(std::uint32_t delta) noexcept
+{
+    if (delta == 0) {
+        rest_ = {};
+        return;
+    }
+    time_ += delta;
+    if (!holds(2))
+        return;
+    const std::size_t length = word(1);
+    isBroken_ = length > rest_.size() - wordSize;
+    if (!isBroken_)
+        rest_ = rest_.subspan(wordSize + length);
+}
+
+// The lower 59 bits of the time: the upper ones stay.
+void TracePageReader::setTime(std::uint32_t low) noexcept
+{
+    constexpr std::uint64_t given = (std::uint64_t{1} << (deltaBits + 32)) - 1;
+    if (!holds(2))
+        return;
+    time_ = (time_ & ~given) | low | std::uint64_t{word(1)} << deltaBits;
+    rest_ = rest_.subspan(2 * wordSize);
+}
+
+} // namespace platform

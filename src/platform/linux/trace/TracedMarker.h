@@ -1,0 +1,18 @@
+// An event on its way from the kernel's pages to the sessions. Putting events in order is copying them a few times, so
+// here they are no larger than what there is to know of them: what sessions get, KernelTraceEvent, has room for much
+// that this system does not tell, and is made for each session when it gets the event.
+#pragma once
+
+#include "platform/linux/trace/TraceMarker.h"
+
+namespace platform {
+
+struct TracedMarker {
+    std::uint64_t timestamp = 0; // of the trace's clock
+    std::uint32_t threadID = 0;
+    std::uint32_t cpu = 0;
+    TraceMarkerRecord record{}; // as it was written to the marker
+};
+static_assert(sizeof(TracedMarker) == 56);
+
+} // namespace platform

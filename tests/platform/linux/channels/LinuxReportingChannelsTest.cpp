@@ -1,0 +1,261 @@
+// The reporting channels of this system: what is published and what the kernel tells, found, sampled and compared as
+// the service does it.
+#include "platform/linux/channels/LinuxReportingChannels.h"
+#include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+
+#include <gmock/gmock.h>
+#include <map>
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using enum LogLevel;
+using support::IsLine;
+using testing::ElementsAre;
+using testing::ElementsAreArray;
+using testing::IsEmpty;
+using testing::Pair;
+using testing::SizeIs;
+
+class LinuxReportingChannelsTest : public testing::Test {
+protected:
+    using Name = std::optional<std::string_view>;
+
+    void publish(const fs::path& place, std::string_view text)
+    {
+        fs::create_directories((root / place).parent_path());
+        support::writeFile(root / place, text);
+    }
+    ReportingChannels::Subscribed subscribe(Name group, Name subgroup)
+    {
+        return channels.createSubscription(*channels.copyChannelsInGroup(group, subgroup).channels);
+    }
+    ReportingSample sample(const ReportingChannels::Subscribed& subscribed)
+    {
+        return channels.createSamples(*subscribed.subscription, *subscribed.channels).value();
+    }
+    static std::map<std::string, std::int64_t> valuesOf(const ReportingSample& sample)
+    {
+        std::map<std::string, std::int64_t> values;
+        for (const ReportingChannel& channel : sample.channels)
+            values[*channel.name] = channel.value;
+        return values;
+    }
+
+    const support::TemporaryDirectory directory;
+    const fs::path root = directory.path() / "channels";
+    const fs::path sound = directory.path() / "asound";
+    support::FakeLog log;
+    LinuxReportingChannels channels{root, sound, ProviderLog(log)};
+};
+
+TEST_F(LinuxReportingChannelsTest, AreNoneOnADeviceWhereNobodyPublishes)
+{
+    const auto found = channels.copyChannelsInGroup("Speaker", std::nullopt);
+    EXPECT_EQ(found.error, std::nullopt);
+    ASSERT_NE(found.channels, nullptr);
+    EXPECT_EQ(channels.channelCount(*found.channels), 0U);
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(LinuxReportingChannelsTest, HoldThoseOfTheSoundCardsInTheirGroups)
+{
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "hda-laptop", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    publish("mixer/Tx/-/late cycles", "simple\n3\n");
+    const auto subscribed = subscribe("Tx", std::nullopt);
+    EXPECT_EQ(channels.channelCount(*subscribed.channels), 13U);
+    const auto before = sample(subscribed);
+    const fs::path status = sound / "card0/pcm0p/sub0/status";
+    std::string text = support::readFile(status);
+    const std::string pointer = "hw_ptr      : 737280";
+    text.replace(text.find(pointer), pointer.size(), "hw_ptr      : 785280");
+    const std::string now = "tstamp      : 10817.482731009";
+    text.replace(text.find(now), now.size(), "tstamp      : 10818.482731009");
+    support::writeFile(status, text);
+    const auto difference = channels.createDifference(before, sample(subscribed)).value();
+    EXPECT_EQ(valuesOf(difference).at("late cycles"), 0);
+    const auto isAnalog = [](const ReportingChannel& channel) { return channel.subgroup == "pcm0p"; };
+    std::vector<ReportingChannel> analog;
+    std::ranges::copy_if(difference.channels, std::back_inserter(analog), isAnalog);
+    ASSERT_THAT(analog, SizeIs(4));
+    EXPECT_EQ(analog[0].value, 48'000);
+    EXPECT_EQ(analog[2].states[0].residency, 1000U);
+    EXPECT_EQ(analog[2].states[0].transitions, 0U) << "it was running before";
+    EXPECT_EQ(analog[3].states[0].name, "S32_LE/48000/2");
+}
+
+TEST_F(LinuxReportingChannelsTest, SayOnceWhatIsWrongWithAFile)
+{
+    publish("amp/Speaker/-/right", "simple\n1\n");
+    publish("amp/Speaker/-/wrong", "simple\n1");
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl", "channel amp/Speaker/-/wrong is left out: it is not finished")));
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(1));
+    EXPECT_THAT(log.take(), IsEmpty());
+    publish("amp/Speaker/-/wrong", "complicated\n1\n");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(1));
+    EXPECT_THAT(log.take(), SizeIs(1)) << "something else is wrong now";
+    publish("amp/Speaker/-/wrong", "simple\n2\n");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(2));
+    EXPECT_THAT(log.take(), IsEmpty());
+    publish("amp/Speaker/-/wrong", "complicated\n1\n");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(1));
+    EXPECT_THAT(log.take(), SizeIs(1)) << "again";
+}
+
+TEST_F(LinuxReportingChannelsTest, NameOnlySoManyFilesAtOnce)
+{
+    for (std::size_t index = 0; index < ChannelComplaints::mostNamed + 5; ++index)
+        publish("amp/Speaker/-/" + std::to_string(index), "half");
+    subscribe("Speaker", std::nullopt);
+    const auto lines = log.take();
+    ASSERT_THAT(lines, SizeIs(ChannelComplaints::mostNamed + 1));
+    EXPECT_EQ(lines.back().message, "5 more channels are left out");
+}
+
+TEST_F(LinuxReportingChannelsTest, NameTheBoundThatASampleMet)
+{
+    std::string large = "histogram\n0 0\n";
+    while (large.size() < 30'000)
+        large += "1000000000000000000 1000000000000000001 1000000000000000000\n";
+    const std::size_t fitting = (ChannelTree::Limits().bytes + large.size() - 1) / large.size();
+    for (std::size_t index = 0; index < fitting + 2; ++index)
+        publish("amp/Speaker/-/" + std::to_string(index), large);
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl",
+                                   "channels left out of a sample: 2, beyond the 2097152 bytes of files "
+                                   "that it takes")));
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(fitting));
+    EXPECT_THAT(log.take(), IsEmpty()) << "once";
+
+    LinuxReportingChannels few(root, sound, ProviderLog(log), {.channels = 10});
+    EXPECT_EQ(few.channelCount(*few.copyChannelsInGroup("Speaker", std::nullopt).channels), 10U);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl", "channels left out of a sample: 62, beyond the 10 that it takes")));
+
+    LinuxReportingChannels blind(root, sound, ProviderLog(log), {.names = 4});
+    EXPECT_EQ(blind.channelCount(*blind.copyChannelsInGroup("Speaker", std::nullopt).channels), 0U);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(Error, "kerl",
+                                   "folders left out of a sample, in part or whole: at least 1, beyond the "
+                                   "4 names that it looks at")));
+}
+
+// What every question meets, as the service asks them when it starts.
+TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
+{
+    fs::create_directories(root);
+    fs::create_directory_symlink(directory.path(), root / "link");
+    for (const char* name : {"a", "b", "c", "d", "e"})
+        publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
+    LinuxReportingChannels bounded(root, sound, ProviderLog(log), {.names = 15});
+    std::vector<ReportingChannels::Subscribed> subscribed;
+    for (const auto& [group, subgroup] : std::vector<std::pair<Name, Name>>{
+             {"QuarnZT4", {}}, {"Speaker", {}}, {{}, "MCA"}, {"Haptics", "Stats"}, {"Rx", {}}, {{}, "HwAudio2"}})
+        if (const auto found = bounded.copyChannelsInGroup(group, subgroup); bounded.channelCount(*found.channels) > 0)
+            subscribed.push_back(bounded.createSubscription(*found.channels));
+    const auto wrong = {
+        IsLine(Error, "kerl", "channel link is left out: Not a directory"),
+        IsLine(Error, "kerl",
+               "folders left out of a sample, in part or whole: at least 1, beyond the 15 names that it looks at")};
+    EXPECT_THAT(log.take(), ElementsAreArray(wrong));
+    ASSERT_THAT(subscribed, SizeIs(2));
+    const auto sampleAll = [&] {
+        for (const auto& each : subscribed)
+            EXPECT_TRUE(bounded.createSamples(*each.subscription, *each.channels));
+    };
+    sampleAll();
+    EXPECT_THAT(log.take(), IsEmpty());
+    fs::remove(root / "link");
+    fs::remove_all(root / "amp/Speaker/MCA");
+    sampleAll();
+    EXPECT_THAT(log.take(), IsEmpty());
+    fs::create_directory_symlink(directory.path(), root / "link");
+    for (const char* name : {"a", "b", "c", "d", "e"})
+        publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
+    sampleAll();
+    EXPECT_THAT(log.take(), ElementsAreArray(wrong)) << "again, after it was right in between";
+}
+
+TEST_F(LinuxReportingChannelsTest, OfSoundCardsAreThereThoughTheTreeCannotBeRead)
+{
+    support::writeFile(root, "a file in its place");
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    const auto found = channels.copyChannelsInGroup("Tx", std::nullopt);
+    EXPECT_EQ(found.error, ENOTDIR);
+    ASSERT_NE(found.channels, nullptr);
+    EXPECT_EQ(channels.channelCount(*found.channels), 16U);
+    const auto subscribed = channels.createSubscription(*found.channels);
+    for (int look = 0; look < 2; ++look)
+        EXPECT_THAT(sample(subscribed).channels, SizeIs(16));
+    const std::string line = "only sound cards have channels: " + root.native() + " cannot be read: Not a directory";
+    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl", line))) << "once";
+    fs::remove(root);
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(16));
+    support::writeFile(root, "again");
+    EXPECT_THAT(sample(subscribed).channels, SizeIs(16));
+    EXPECT_THAT(log.take(), ElementsAre(IsLine(Error, "kerl", line)));
+}
+
+TEST_F(LinuxReportingChannelsTest, DoNotSayAgainWhatWasWrongBeforeTheTreeCouldNotBeRead)
+{
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    publish("amp/Tx/-/wrong", "simple\n1");
+    const auto subscribed = subscribe("Tx", std::nullopt);
+    EXPECT_THAT(log.take(), SizeIs(1));
+    fs::rename(root, directory.path() / "away");
+    support::writeFile(root, "a file in its place");
+    sample(subscribed);
+    EXPECT_THAT(log.take(), SizeIs(1)) << "the tree";
+    fs::remove(root);
+    fs::rename(directory.path() / "away", root);
+    sample(subscribed);
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(LinuxReportingChannelsTest, AreAnErrorWhereTheTreeCannotBeReadAndNoSoundCardHasAny)
+{
+    publish("amp/Speaker/-/a", "simple\n1\n");
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    fs::remove_all(root);
+    support::writeFile(root, "a file in its place");
+    EXPECT_EQ(channels.createSamples(*subscribed.subscription, *subscribed.channels).error(), ENOTDIR);
+}
+
+// That it is not in the first sample says nothing then: what it holds was not counted in between.
+TEST_F(LinuxReportingChannelsTest, ThatTheFirstSampleCouldNotSeeHaveNoDifference)
+{
+    fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
+             fs::copy_options::recursive | fs::copy_options::copy_symlinks);
+    publish("amp/Tx/-/late cycles", "simple\n1000000\n");
+    const auto subscribed = subscribe("Tx", std::nullopt);
+    fs::rename(root, directory.path() / "away");
+    support::writeFile(root, "a file in its place");
+    const auto before = sample(subscribed);
+    fs::remove(root);
+    fs::rename(directory.path() / "away", root);
+    const auto difference = channels.createDifference(before, sample(subscribed)).value();
+    EXPECT_THAT(difference.channels, SizeIs(16));
+    EXPECT_THAT(valuesOf(difference), testing::Not(testing::Contains(testing::Key("late cycles"))));
+}
+
+TEST_F(LinuxReportingChannelsTest, OfASubscriptionStayItsOwnWhenTheTreeGoesAndComesBack)
+{
+    publish("amp/Speaker/-/a", "simple\n1\n");
+    const auto subscribed = subscribe("Speaker", std::nullopt);
+    fs::remove_all(root);
+    EXPECT_THAT(sample(subscribed).channels, IsEmpty());
+    publish("amp/Speaker/-/a", "simple\n2\n");
+    publish("amp/Tx/-/b", "simple\n3\n");
+    EXPECT_THAT(valuesOf(sample(subscribed)), ElementsAre(Pair("a", 2)));
+}
+
+} // namespace
+} // namespace platform

@@ -1,0 +1,139 @@
+// A client of a listener that speaks in bytes: it can do everything that a hostile one could.
+#pragma once
+
+#include "foundation/cbor/Cbor.h"
+#include "platform/linux/connection/FrameReader.h"
+#include "platform/linux/files/FileDescriptor.h"
+#include "support/Progress.h"
+
+#include <cerrno>
+#include <filesystem>
+#include <gtest/gtest.h>
+#include <optional>
+#include <poll.h>
+#include <stdexcept>
+#include <string>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <system_error>
+#include <vector>
+
+namespace support {
+
+// The encoding of a value as one frame, with its head.
+inline std::string framed(const foundation::Value& value)
+{
+    std::string item;
+    foundation::appendCbor(value, item);
+    std::string bytes;
+    platform::appendFrame(item, bytes);
+    return bytes;
+}
+
+// The call with that number, and text to make it as large as a test needs it.
+inline std::string callNumber(int number, std::size_t textLength = 0)
+{
+    return framed(foundation::Array{number, std::string(textLength, 'x')});
+}
+
+inline std::string answerTo(const foundation::Array& call, std::size_t textLength = 0)
+{
+    std::string frame;
+    foundation::appendCbor(foundation::Array{call[0], std::string(textLength, 'y')}, frame);
+    return frame;
+}
+
+class Client {
+public:
+    explicit Client(const std::filesystem::path& path) : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0))
+    {
+        sockaddr_un address = {};
+        address.sun_family = AF_UNIX;
+        path.string().copy(address.sun_path, sizeof address.sun_path - 1);
+        if (::connect(socket_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0)
+            throw std::system_error(errno, std::generic_category(), "connect");
+    }
+
+    // Blocks until the service has taken the bytes.
+    void write(std::string_view bytes)
+    {
+        while (!bytes.empty()) {
+            const ssize_t count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
+            if (count < 0)
+                throw std::system_error(errno, std::generic_category(), "send");
+            bytes.remove_prefix(static_cast<std::size_t>(count));
+        }
+    }
+
+    // Writes as much as the service takes without being waited for; how many bytes that were.
+    std::size_t writeWhatFits(std::string_view bytes)
+    {
+        const ssize_t count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
+        return count < 0 ? 0 : static_cast<std::size_t>(count);
+    }
+
+    // The first number of the next frame; nothing when the service closed or reset the connection.
+    std::optional<int> readNumber()
+    {
+        while (true) {
+            const auto frame = reader_.next();
+            if (!frame)
+                throw std::runtime_error("the service sent a frame that is too long");
+            if (*frame) {
+                const auto value = decoder_.decode(**frame);
+                return static_cast<int>((*value->array())[0].number()->int64Value());
+            }
+            if (!readMore())
+                return std::nullopt;
+        }
+    }
+
+    // The numbers of so many frames.
+    std::vector<int> readNumbers(std::size_t count)
+    {
+        std::vector<int> numbers;
+        while (numbers.size() < count) {
+            const auto number = readNumber();
+            if (!number)
+                break;
+            numbers.push_back(*number);
+        }
+        return numbers;
+    }
+
+    // Whether something is there to be read now.
+    bool hasSomethingToRead()
+    {
+        pollfd events = {socket_.get(), POLLIN, 0};
+        return ::poll(&events, 1, 0) == 1;
+    }
+
+    void waitForSomethingToRead()
+    {
+        pollfd events = {socket_.get(), POLLIN, 0};
+        ASSERT_EQ(::poll(&events, 1, static_cast<int>(std::chrono::milliseconds(longestWait).count())), 1);
+    }
+
+    void close() { socket_ = platform::FileDescriptor(); }
+    void stopWriting() { ::shutdown(socket_.get(), SHUT_WR); }
+    void stopReading() { ::shutdown(socket_.get(), SHUT_RD); }
+    [[nodiscard]] int descriptor() const { return socket_.get(); }
+
+private:
+    bool readMore()
+    {
+        waitForSomethingToRead();
+        const ssize_t count = ::recv(socket_.get(), buffer_.data(), buffer_.size(), MSG_DONTWAIT);
+        if (count <= 0)
+            return false;
+        reader_.feed({buffer_.data(), static_cast<std::size_t>(count)});
+        return true;
+    }
+
+    platform::FileDescriptor socket_;
+    platform::FrameReader reader_;
+    foundation::CborDecoder decoder_;
+    std::vector<char> buffer_ = std::vector<char>(256 * 1024);
+};
+
+} // namespace support

@@ -1,0 +1,395 @@
+// Clients that ask for too much or read too little, and too many of them: each limit holds, costs only whoever met
+// it, and is left again.
+#include "platform/linux/connection/ConnectionHarness.h"
+#include "platform/linux/connection/Outbox.h"
+#include "support/Sanitizers.h"
+
+#include <atomic>
+#include <gmock/gmock.h>
+#include <sys/resource.h>
+
+namespace platform {
+namespace {
+
+using foundation::Array;
+using support::answerTo;
+using support::callNumber;
+using support::Client;
+using support::ConnectionRecord;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::StartsWith;
+
+class ConnectionLimits : public support::ConnectionTest {
+protected:
+    // Writes calls with so much text, numbered from 0, until the service has stopped reading them and the socket
+    // is full; how many were written, but for the last one's `unfinished` rest.
+    int writeUntilNotRead(Client& client, std::size_t textLength)
+    {
+        for (int number = 0;; ++number) {
+            unfinished = callNumber(number, textLength);
+            while (!unfinished.empty()) {
+                const std::size_t count = client.writeWhatFits(unfinished);
+                unfinished.erase(0, count);
+                if (count == 0 && listener->counters().readingPauses == 1)
+                    return number;
+            }
+        }
+    }
+
+    std::string unfinished; // the rest of the call that was being written
+};
+
+TEST_F(ConnectionLimits, ASlowReaderGetsAllOfALargeAnswer)
+{
+    constexpr int answers = 6;
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    for (int answer = 1; answer <= answers; ++answer)
+        record.connection->send(answerTo({answer}, 700 * 1024)); // more than a socket takes
+    EXPECT_EQ(client.readNumbers(answers), (std::vector<int>{1, 2, 3, 4, 5, 6}));
+}
+
+TEST_F(ConnectionLimits, WhoDoesNotReadItsAnswersHoldsUpOnlyItself)
+{
+    constexpr std::size_t answerSize = 512 * 1024;
+    constexpr int answers = static_cast<int>(LinuxConnection::manyUnsentBytes / answerSize) + 2;
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    Client other(path);
+    ConnectionRecord& otherRecord = connected();
+
+    for (int answer = 1; answer <= answers; ++answer)
+        record.connection->send(answerTo({answer}, answerSize));
+    EXPECT_EQ(listener->counters().readingPauses, 1U);
+    client.write(callNumber(1));
+
+    other.write(callNumber(1));
+    ASSERT_TRUE(waitForHistory(otherRecord, {"call 1"}));
+    otherRecord.connection->send(answerTo({1}));
+    EXPECT_EQ(other.readNumber(), 1);
+    EXPECT_EQ(callsOf(record), 0U) << "it was read from";
+
+    for (int answer = 1; answer <= answers; ++answer)
+        EXPECT_EQ(client.readNumber(), answer);
+    EXPECT_TRUE(waitForHistory(record, {"call 1"}));
+    EXPECT_THAT(logged(), IsEmpty());
+    EXPECT_EQ(listener->counters().droppedBytes, 0U);
+}
+
+TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
+{
+    constexpr std::size_t answerSize = 1000 * 1024;
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    Client other(path);
+    ConnectionRecord& otherRecord = connected();
+    std::size_t sent = 0;
+    while (sent <= LinuxConnection::mostUnsentBytes + 1024 * 1024) { // more than the socket takes on top
+        const std::string answer = answerTo({1}, answerSize);
+        record.connection->send(answer);
+        sent += frameHeadSize + answer.size();
+    }
+    EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
+    EXPECT_THAT(logged(), ElementsAre(endsBecause("it does not read its answers")));
+    EXPECT_GT(listener->counters().droppedBytes, LinuxConnection::mostUnsentBytes);
+    EXPECT_LE(listener->counters().droppedBytes, sent);
+    EXPECT_THAT(loggedBehind(),
+                ElementsAre(testing::MatchesRegex("connection of process .* was behind: reading paused "
+                                                  "1 times, [0-9]+ bytes of answers were dropped")));
+
+    other.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(otherRecord, {"call 1"}));
+}
+
+TEST_F(ConnectionLimits, AnAnswerThatNoFrameHoldsBreaksTheConnection)
+{
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    record.connection->send(std::string(longestFrame + 1, 'x'));
+    EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
+    EXPECT_THAT(logged(), ElementsAre(endsBecause("an answer is longer than a frame may be")));
+    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + longestFrame + 1);
+}
+
+TEST_F(ConnectionLimits, ReadingStopsWhileTheBytesOfUnansweredCallsAreTooMany)
+{
+    constexpr std::size_t textLength = 10 * 1024;
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    writeUntilNotRead(client, textLength);
+    const std::size_t calls = callsOf(record);
+    EXPECT_GT(calls * (textLength + 16), LinuxConnection::mostUnansweredBytes);
+    EXPECT_LT(calls * textLength, LinuxConnection::mostUnansweredBytes + ConnectionHub::mostReadAtOnce + textLength);
+
+    // Another client is read from, and nothing more of this one.
+    Client other(path);
+    ConnectionRecord& otherRecord = connected();
+    other.write(callNumber(1));
+    ASSERT_TRUE(waitForHistory(otherRecord, {"call 1"}));
+    EXPECT_EQ(callsOf(record), calls);
+
+    // The answers let it go on, from whichever thread they come.
+    std::vector<Connection::Call> answered = progress.look([&] { return std::exchange(record.calls, {}); });
+    answered.clear();
+    client.write(unfinished);
+    EXPECT_TRUE(waitForCalls(record, 1));
+    EXPECT_EQ(listener->counters().interrupted, 0U);
+}
+
+TEST_F(ConnectionLimits, ReadingStopsWhileTheUnansweredCallsAreTooMany)
+{
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    writeUntilNotRead(client, 0);
+    const std::size_t calls = callsOf(record);
+    const std::size_t mostInOneRead = ConnectionHub::mostReadAtOnce / callNumber(1).size();
+    EXPECT_GT(calls, LinuxConnection::mostUnansweredCalls);
+    EXPECT_LE(calls, LinuxConnection::mostUnansweredCalls + mostInOneRead + 1);
+    progress.look([&] { return std::exchange(record.calls, {}); }).clear();
+    client.write(unfinished);
+    EXPECT_TRUE(waitForCalls(record, 1));
+}
+
+// A client that takes no answers any more may have much to say still.
+TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAllTheSame)
+{
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    client.write(callNumber(1));
+    ASSERT_TRUE(waitForCalls(record, 1));
+    client.stopReading();
+    record.connection->send(answerTo({1}));
+    client.write(callNumber(2));
+    EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2"}));
+    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({1}).size());
+    client.close();
+    EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2", "invalidated"}));
+}
+
+// Reading stops because of what waits to be sent, and nothing of it is: it must go on when all of that was dropped.
+TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDropped)
+{
+    constexpr std::size_t answerSize = 1000 * 1024;
+    constexpr std::size_t answers = LinuxConnection::manyUnsentBytes / answerSize + 1; // a turn
+    std::vector<WorkItem> letters;
+    LinuxWorkQueues queues;
+    queues.setTurnEndHandler([&] {
+        if (auto send = Outbox::endTurn())
+            progress.change([&] { letters.push_back(std::move(send)); });
+    });
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    {
+        const auto queue = queues.makeSerialQueue("server", QualityOfService::UserInteractive);
+        for (std::size_t turn = 1; turn <= 2; ++turn) {
+            queue->submit([&] {
+                for (std::size_t answer = 0; answer < answers; ++answer)
+                    record.connection->send(answerTo({1}, answerSize));
+            });
+            ASSERT_TRUE(progress.waitFor([&] { return letters.size() == turn; }));
+        }
+    }
+    client.stopReading();
+    for (WorkItem& letter : letters)
+        letter();
+    EXPECT_GT(listener->counters().droppedBytes, 2 * LinuxConnection::manyUnsentBytes);
+    client.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(record, {"call 1"}));
+}
+
+// As do the starts of ten thousand sessions, which are answered when they stop.
+TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
+{
+    constexpr int starts = 10'000;
+    constexpr std::uint64_t others = 50'000;
+    std::vector<std::shared_ptr<void>> held;
+    std::atomic<std::uint64_t> answered = 0;
+    handler = [&](ConnectionRecord&, Connection::Call& call) -> std::expected<void, Connection::Violation> {
+        if (held.size() < starts)
+            held.push_back(std::move(call.caller));
+        else
+            ++answered;
+        return {};
+    };
+    listen();
+    Client client(path);
+    for (int number = 0; number < starts + static_cast<int>(others); ++number)
+        client.write(callNumber(number, 10));
+    EXPECT_TRUE(waitForCounter(answered, others));
+}
+
+TEST_F(ConnectionLimits, AClientThatGoesWhileItIsNotReadFromIsNoticed)
+{
+    listen();
+    Client client(path);
+    ConnectionRecord& record = connected();
+    const int written = writeUntilNotRead(client, 1000);
+    client.close();
+    EXPECT_TRUE(waitForEnd(record));
+    stop();
+    EXPECT_EQ(record.calls.size(), static_cast<std::size_t>(written)) << "what it had written was lost";
+    EXPECT_THAT(loggedBehind(),
+                ElementsAre(testing::EndsWith("was behind: reading paused 1 times, 0 bytes of answers were dropped")));
+}
+
+TEST_F(ConnectionLimits, CreditGivenBackFromManyThreadsIsAllThere)
+{
+    constexpr int rounds = 50'000;
+    std::mutex mutex;
+    std::vector<std::shared_ptr<void>> held;
+    std::atomic<std::uint64_t> delivered = 0;
+    handler = [&](ConnectionRecord&, Connection::Call& call) -> std::expected<void, Connection::Violation> {
+        const std::scoped_lock lock(mutex);
+        held.push_back(std::move(call.caller));
+        ++delivered;
+        return {};
+    };
+    listen();
+    Client client(path);
+    std::vector<std::jthread> answering;
+    for (int index = 0; index < 3; ++index) {
+        answering.emplace_back([&](const std::stop_token& stopped) {
+            while (!stopped.stop_requested()) {
+                std::vector<std::shared_ptr<void>> some;
+                {
+                    const std::scoped_lock lock(mutex);
+                    some.assign(std::make_move_iterator(held.end() - static_cast<std::ptrdiff_t>(held.size() / 2)),
+                                std::make_move_iterator(held.end()));
+                    held.resize(held.size() - held.size() / 2);
+                    if (held.size() == 1)
+                        held.clear();
+                }
+                std::this_thread::yield();
+            }
+        });
+    }
+    std::string calls;
+    for (int number = 0; number < 100; ++number)
+        calls += callNumber(number, 100);
+    for (int sent = 0; sent < rounds; sent += 100)
+        client.write(calls); // blocks for ever when a credit is lost
+    EXPECT_TRUE(waitForCounter(delivered, rounds));
+}
+
+// When descriptors run out.
+
+class Descriptors : public support::ConnectionTest {
+protected:
+    Descriptors() { ::getrlimit(RLIMIT_NOFILE, &before); }
+    ~Descriptors() override { ::setrlimit(RLIMIT_NOFILE, &before); }
+
+    void limitTo(rlim_t count) const
+    {
+        rlimit limit = before;
+        limit.rlim_cur = count;
+        ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &limit), 0);
+    }
+
+    // The number that the next descriptor will have.
+    static rlim_t nextDescriptor() { return static_cast<rlim_t>(FileDescriptor(::dup(0)).get()); }
+
+    rlimit before = {};
+};
+
+TEST_F(Descriptors, ClientsWaitUntilThereIsADescriptorForThem)
+{
+    KESTO_SKIP_WHERE_TYPES_ARE_CHECKED();
+    listen();
+    Client first(path);
+    ConnectionRecord& record = connected();
+    Client second(path);
+    connected();
+    Client third(path);
+    ConnectionRecord& ofThird = connected();
+    limitTo(nextDescriptor() + 1);
+    Client waiting(path); // takes the last one, so that none is left to accept it with
+    ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
+
+    // Meanwhile the others are served, and the service does not ask again and again.
+    third.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(ofThird, {"call 1"}));
+    first.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(record, {"call 1"}));
+    EXPECT_EQ(listener->counters().acceptingPauses, 1U);
+    EXPECT_THAT(logged(), ElementsAre("new connections have to wait, with 3 open: Too many open files"));
+
+    // A connection that ends makes room at once.
+    waiting.write(callNumber(1));
+    first.close();
+    EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
+}
+
+TEST_F(Descriptors, ClientsAreAcceptedAfterAPauseWhenDescriptorsWereFreedElsewhere)
+{
+    KESTO_SKIP_WHERE_TYPES_ARE_CHECKED();
+    listen();
+    limitTo(nextDescriptor() + 1);
+    Client waiting(path);
+    ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
+    ::setrlimit(RLIMIT_NOFILE, &before);
+    waiting.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
+    EXPECT_EQ(logged().size(), 1U);
+}
+
+TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
+{
+    constexpr std::size_t most = 8;
+    constexpr std::size_t mostOfOneUser = most - most / LinuxConnectionListener::partForOthers;
+    limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
+    listen();
+    ::setrlimit(RLIMIT_NOFILE, &before);
+    std::vector<std::unique_ptr<Client>> clients;
+    for (std::size_t index = 0; index < mostOfOneUser; ++index) {
+        clients.push_back(std::make_unique<Client>(path));
+        connected();
+    }
+    for (int attempt = 0; attempt < 3; ++attempt)
+        EXPECT_EQ(Client(path).readNumber(), std::nullopt) << "it is closed at once";
+    EXPECT_EQ(listener->counters().refused, 3U);
+    EXPECT_EQ(listener->counters().accepted, mostOfOneUser);
+    EXPECT_THAT(
+        logged(),
+        ElementsAre("user " + std::to_string(::getuid()) + " has 6 connections and gets no more until one ends"));
+
+    const auto last = progress.look([&] { return records.back(); });
+    clients.pop_back();
+    ASSERT_TRUE(waitForEnd(*last));
+    Client again(path);
+    again.write(callNumber(1));
+    EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
+    EXPECT_EQ(Client(path).readNumber(), std::nullopt);
+    EXPECT_EQ(logged().size(), 2U) << "and is said again";
+}
+
+TEST_F(Descriptors, SomeAreKeptFromClients)
+{
+    constexpr std::size_t most = 3;
+    limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
+    listen();
+    ::setrlimit(RLIMIT_NOFILE, &before); // what was allowed at the start counts
+    std::vector<std::unique_ptr<Client>> clients;
+    for (std::size_t index = 0; index < most; ++index) {
+        clients.push_back(std::make_unique<Client>(path));
+        connected();
+    }
+    Client waiting(path);
+    waiting.write(callNumber(1));
+    ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
+    EXPECT_EQ(listener->counters().accepted, most);
+    clients.pop_back();
+    EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
+    EXPECT_THAT(logged(), ElementsAre("new connections have to wait, with 3 open: Too many open files"));
+}
+
+} // namespace
+} // namespace platform

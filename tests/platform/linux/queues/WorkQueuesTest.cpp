@@ -1,0 +1,531 @@
+// Real threads, which are made to meet at the moments that matter by letting them wait for each other, never for a
+// while.
+#include "platform/linux/NoThreads.h"
+#include "platform/linux/process/Thread.h"
+#include "platform/linux/queues/LinuxWorkQueues.h"
+#include "platform/linux/queues/SerialQueue.h"
+#include "support/Threads.h"
+#include "support/WatchedThread.h"
+
+#include <algorithm>
+#include <array>
+#include <atomic>
+#include <gtest/gtest.h>
+#include <latch>
+#include <pthread.h>
+#include <set>
+#include <string>
+#include <sys/resource.h>
+#include <thread>
+#include <unistd.h>
+#include <vector>
+
+namespace platform {
+namespace {
+
+using namespace std::chrono_literals;
+using support::threadsOfTheProcess;
+
+class WorkQueuesTest : public testing::Test {
+protected:
+    std::shared_ptr<WorkQueue> makeQueue(QualityOfService quality = QualityOfService::Default)
+    {
+        return queues.makeSerialQueue("com.quarn.kesto.test", quality);
+    }
+
+    // Returns when everything submitted to the serial queue before has been run.
+    void drain(WorkQueue& queue)
+    {
+        const auto done = queues.makeSemaphore(0);
+        queue.submit([&] { done->signal(); });
+        done->wait();
+    }
+
+    LinuxWorkQueues queues;
+};
+
+std::string nameOfThisThread()
+{
+    std::array<char, 16> name = {};
+    pthread_getname_np(pthread_self(), name.data(), name.size());
+    return name.data();
+}
+
+int niceValue(id_t id)
+{
+    return getpriority(PRIO_PROCESS, id);
+}
+
+TEST_F(WorkQueuesTest, SerialQueueRunsOneItemAtATimeInTheOrderOfEachSubmitter)
+{
+    constexpr int submitters = 4;
+    constexpr int items = 2000;
+    const auto queue = makeQueue(QualityOfService::UserInteractive);
+    std::vector<std::vector<int>> ran(submitters); // without a lock: only the queue touches it
+    {
+        std::vector<std::jthread> threads;
+        for (int submitter = 0; submitter < submitters; ++submitter) {
+            threads.emplace_back([&, submitter] {
+                for (int item = 0; item < items; ++item)
+                    queue->submit(
+                        [&ran, submitter, item] { ran[static_cast<std::size_t>(submitter)].push_back(item); });
+            });
+        }
+    }
+    drain(*queue);
+    for (const auto& ofOne : ran) {
+        EXPECT_EQ(ofOne.size(), static_cast<std::size_t>(items));
+        EXPECT_TRUE(std::ranges::is_sorted(ofOne));
+    }
+}
+
+// The history of a queue with turns: numbers are items, 0 is the end of a turn.
+class TurnsTest : public WorkQueuesTest {
+protected:
+    TurnsTest()
+    {
+        queues.setTurnEndHandler([this] {
+            history.push_back(0);
+            threads.push_back(std::this_thread::get_id());
+        });
+        queue = makeQueue(QualityOfService::UserInteractive);
+        waitUntilAsleep();
+    }
+    ~TurnsTest() override { queue.reset(); }
+
+    // Until the queue's thread sleeps, so that it runs nothing unless it is woken.
+    void waitUntilAsleep()
+    {
+        queue->submit([&] { queueThread = gettid(); });
+        drain(*queue);
+        while (!support::isAsleep(queueThread))
+            std::this_thread::yield();
+        SerialQueue::Helper helper;
+        queue->submit([] { });
+        helper.help(); // after which this thread has seen what that one did
+        history.clear();
+        threads.clear();
+    }
+
+    void submit(int item)
+    {
+        queue->submit([this, item] {
+            history.push_back(item);
+            threads.push_back(std::this_thread::get_id());
+        });
+    }
+
+    std::vector<int> history;
+    std::vector<std::thread::id> threads;
+    pid_t queueThread = 0;
+    std::shared_ptr<WorkQueue> queue;
+};
+
+TEST_F(TurnsTest, WhatGatheredWhileATurnRanIsTheNextTurn)
+{
+    const auto begun = queues.makeSemaphore(0);
+    const auto gathered = queues.makeSemaphore(0);
+    queue->submit([&] {
+        begun->signal();
+        gathered->wait();
+        history.push_back(1);
+    });
+    begun->wait();
+    for (int item = 2; item <= 5; ++item)
+        submit(item);
+    gathered->signal();
+    queue.reset(); // runs everything
+    EXPECT_EQ(history, (std::vector<int>{1, 0, 2, 3, 4, 5, 0}));
+}
+
+TEST_F(TurnsTest, ATurnEndsWhenAllThatItsItemsHeldIsGone)
+{
+    class Note {
+    public:
+        explicit Note(std::vector<int>& history) : history_(history) { }
+        ~Note() { history_.push_back(7); }
+
+    private:
+        std::vector<int>& history_;
+    };
+    queue->submit([note = std::make_shared<Note>(history)] { });
+    queue.reset();
+    EXPECT_EQ(history, (std::vector<int>{7, 0}));
+}
+
+TEST_F(TurnsTest, TurnIsRunningInsideItsItemsOnly)
+{
+    bool insideItem = false;
+    queue->submit([&] { insideItem = SerialQueue::isTurnRunning(); });
+    drain(*queue);
+    EXPECT_TRUE(insideItem);
+    EXPECT_FALSE(SerialQueue::isTurnRunning());
+
+    const auto withoutTurns = makeQueue(QualityOfService::Default);
+    withoutTurns->submit([&] { insideItem = SerialQueue::isTurnRunning(); });
+    drain(*withoutTurns);
+    EXPECT_FALSE(insideItem);
+}
+
+TEST_F(WorkQueuesTest, TheTurnIsOverWhenItsEndHandlerIsCalled)
+{
+    bool wasTurnRunning = true;
+    bool wasCurrent = false;
+    WorkQueue* queueOfHandler = nullptr;
+    queues.setTurnEndHandler([&] {
+        wasTurnRunning = SerialQueue::isTurnRunning();
+        wasCurrent = queueOfHandler->isCurrent();
+    });
+    auto queue = makeQueue(QualityOfService::UserInteractive);
+    queueOfHandler = queue.get();
+    queue->submit([] { });
+    queue.reset();
+    EXPECT_FALSE(wasTurnRunning);
+    EXPECT_TRUE(wasCurrent);
+}
+
+TEST_F(TurnsTest, AHelperRunsATurnItselfWithItsEnd)
+{
+    SerialQueue::Helper helper;
+    submit(1);
+    submit(2);
+    EXPECT_TRUE(history.empty()); // nobody was woken, so this is no race
+    helper.help();
+    EXPECT_EQ(history, (std::vector<int>{1, 2, 0}));
+    EXPECT_EQ(std::set(threads.begin(), threads.end()), std::set{std::this_thread::get_id()});
+    helper.help();
+    EXPECT_EQ(history.size(), 3U) << "there was no other turn";
+    submit(3);
+    helper.help();
+    EXPECT_EQ(history, (std::vector<int>{1, 2, 0, 3, 0}));
+}
+
+TEST_F(TurnsTest, AHelpedTurnIsTheQueues)
+{
+    SerialQueue::Helper helper;
+    bool isCurrent = false;
+    bool isTurnRunning = false;
+    queue->submit([&] {
+        isCurrent = queue->isCurrent();
+        isTurnRunning = SerialQueue::isTurnRunning();
+    });
+    helper.help();
+    EXPECT_TRUE(isCurrent);
+    EXPECT_TRUE(isTurnRunning);
+    EXPECT_FALSE(queue->isCurrent());
+    EXPECT_FALSE(SerialQueue::isTurnRunning());
+}
+
+TEST_F(TurnsTest, AHelperThatLeavesRunsWhatItHasSubmitted)
+{
+    {
+        const SerialQueue::Helper helper;
+        submit(1);
+    }
+    EXPECT_EQ(history, (std::vector<int>{1, 0}));
+}
+
+TEST_F(TurnsTest, WhatIsSubmittedDuringAHelpedTurnGoesToTheQueuesThread)
+{
+    SerialQueue::Helper helper;
+    const auto done = queues.makeSemaphore(0);
+    queue->submit([&] {
+        history.push_back(1);
+        submit(2); // by the turn itself
+        std::jthread([&] { queue->submit([&] { done->signal(); }); }); // and by somebody else
+    });
+    helper.help();
+    done->wait(); // without help
+    queue.reset();
+    EXPECT_EQ(history, (std::vector<int>{1, 0, 2, 0}));
+    EXPECT_NE(threads.back(), std::this_thread::get_id());
+}
+
+TEST_F(TurnsTest, TheQueuesThreadWaitsUntilAHelpedTurnHasEnded)
+{
+    SerialQueue::Helper helper;
+    std::jthread other;
+    queue->submit([&] {
+        submit(2);
+        std::atomic<pid_t> otherThread = 0;
+        other = std::jthread([&] {
+            otherThread = gettid();
+            queue.reset(); // wakes the queue's thread, which finds something to do
+        });
+        while (otherThread == 0 || !support::isAsleep(otherThread) || !support::isAsleep(queueThread))
+            std::this_thread::yield();
+        history.push_back(1);
+    });
+    helper.help();
+    other.join();
+    EXPECT_EQ(history, (std::vector<int>{1, 0, 2, 0}));
+}
+
+TEST_F(TurnsTest, ABurstGoesToTheQueuesThread)
+{
+    const SerialQueue::Helper helper;
+    const auto done = queues.makeSemaphore(0);
+    for (std::size_t item = 0; item < SerialQueue::mostItemsHelpedWith; ++item)
+        submit(1);
+    EXPECT_TRUE(history.empty());
+    queue->submit([&] { done->signal(); });
+    done->wait(); // without help
+    queue.reset();
+    EXPECT_EQ(std::ranges::count(history, 1), SerialQueue::mostItemsHelpedWith);
+    EXPECT_FALSE(std::ranges::count(threads, std::this_thread::get_id()));
+}
+
+TEST_F(TurnsTest, NobodyHelpsWithAQueueThatIsBusy)
+{
+    const auto begun = queues.makeSemaphore(0);
+    const auto proceed = queues.makeSemaphore(0);
+    queue->submit([&] {
+        begun->signal();
+        proceed->wait();
+    });
+    begun->wait();
+    SerialQueue::Helper helper;
+    submit(1);
+    helper.help();
+    EXPECT_TRUE(history.empty());
+    proceed->signal();
+    queue.reset();
+    EXPECT_EQ(history, (std::vector<int>{0, 1, 0}));
+}
+
+TEST_F(TurnsTest, TurnsOfHelpersAndOfTheQueuesThreadNeverOverlap)
+{
+    constexpr int items = 3000;
+    int ran = 0; // without a lock: only turns touch it
+    {
+        std::vector<std::jthread> threadsOfHelpers;
+        for (int helpers = 0; helpers < 2; ++helpers) {
+            threadsOfHelpers.emplace_back([&] {
+                SerialQueue::Helper helper;
+                for (int item = 0; item < items; ++item) {
+                    queue->submit([&] { ++ran; });
+                    if (item % 3 == 0)
+                        helper.help();
+                }
+            });
+        }
+        for (int item = 0; item < items; ++item)
+            queue->submit([&] { ++ran; });
+    }
+    queue.reset();
+    EXPECT_EQ(ran, 3 * items);
+}
+
+TEST_F(TurnsTest, AQueueMayBeDroppedByAnItemThatAHelperRuns)
+{
+    SerialQueue::Helper helper;
+    queue->submit([&] {
+        history.push_back(1);
+        queue.reset();
+    });
+    helper.help();
+    EXPECT_EQ(history, (std::vector<int>{1, 0}));
+}
+
+TEST_F(WorkQueuesTest, OnlyInteractiveQueuesAreHelped)
+{
+    const auto queue = makeQueue(QualityOfService::Default);
+    const SerialQueue::Helper helper;
+    const auto done = queues.makeSemaphore(0);
+    queue->submit([&] { done->signal(); });
+    done->wait(); // which its own thread must have run
+}
+
+TEST_F(WorkQueuesTest, AQueueThatGoesRunsWhatWasSubmittedBefore)
+{
+    int ran = 0;
+    auto queue = makeQueue();
+    for (int item = 0; item < 1000; ++item)
+        queue->submit([&] { ++ran; });
+    queue.reset();
+    EXPECT_EQ(ran, 1000);
+}
+
+TEST_F(WorkQueuesTest, QueuesOutliveTheirMaker)
+{
+    auto maker = std::make_unique<LinuxWorkQueues>();
+    const auto queue = maker->makeSerialQueue("left", QualityOfService::Default);
+    maker.reset();
+    drain(*queue);
+}
+
+TEST_F(WorkQueuesTest, ThreadsHaveTheLastWordsOfTheirQueuesName)
+{
+    EXPECT_EQ(threadName("Tracing Queue"), "Tracing Queue");
+    EXPECT_EQ(threadName("com.quarn.kesto.reporting.server"), "server");
+    EXPECT_EQ(threadName("com.short"), "com.short");
+    EXPECT_EQ(threadName("a-name-without-any-dot"), "a-name-without-");
+
+    const auto queue = makeQueue();
+    std::string name;
+    queue->submit([&] { name = nameOfThisThread(); });
+    drain(*queue);
+    EXPECT_EQ(name, "kesto.test");
+}
+
+TEST_F(WorkQueuesTest, PrioritiesFollowTheQualityOfServiceAsFarAsTheProcessMay)
+{
+    const int ofTheProcess = niceValue(0);
+    int interactive = 99;
+    int ordinary = 99;
+    int background = 99;
+    const auto interactiveQueue = makeQueue(QualityOfService::UserInteractive);
+    interactiveQueue->submit([&] {
+        interactive = niceValue(static_cast<id_t>(gettid()));
+        const auto ordinaryQueue = makeQueue(QualityOfService::Default); // by a thread of another priority
+        ordinaryQueue->submit([&] { ordinary = niceValue(static_cast<id_t>(gettid())); });
+        drain(*ordinaryQueue);
+    });
+    drain(*interactiveQueue);
+    const auto done = queues.makeSemaphore(0);
+    queues.backgroundQueue().submit([&] {
+        background = niceValue(static_cast<id_t>(gettid()));
+        done->signal();
+    });
+    done->wait();
+    EXPECT_TRUE(interactive == ofTheProcess - 10 || interactive == ofTheProcess) << interactive;
+    EXPECT_EQ(ordinary, ofTheProcess);
+    EXPECT_EQ(background, std::min(ofTheProcess + 10, 19));
+}
+
+TEST_F(WorkQueuesTest, AHelperHasThePriorityOfTheQueuesThatItHelpsAsLongAsItDoes)
+{
+    const int ofTheProcess = niceValue(0);
+    int ofTheQueue = 99;
+    const auto queue = makeQueue(QualityOfService::UserInteractive);
+    queue->submit([&] { ofTheQueue = niceValue(static_cast<id_t>(gettid())); });
+    drain(*queue);
+    if (ofTheQueue == ofTheProcess)
+        GTEST_SKIP() << "this process may not raise priorities";
+    {
+        const SerialQueue::Helper helper;
+        EXPECT_EQ(niceValue(0), ofTheQueue);
+        int ordinary = 99;
+        const auto ordinaryQueue = makeQueue(QualityOfService::Default);
+        ordinaryQueue->submit([&] { ordinary = niceValue(static_cast<id_t>(gettid())); });
+        drain(*ordinaryQueue);
+        EXPECT_EQ(ordinary, ofTheProcess) << "what a thread starts does not have its helper's priority";
+    }
+    EXPECT_EQ(niceValue(0), ofTheProcess);
+}
+
+TEST_F(WorkQueuesTest, BackgroundItemsRunSideBySideOnAFewThreads)
+{
+    constexpr std::size_t items = 40;
+    const std::size_t threadsBefore = threadsOfTheProcess();
+    std::latch together(BackgroundQueue::mostThreads + 1); // reached only if so many run at once
+    std::latch done(items);
+    for (std::size_t item = 0; item < items; ++item) {
+        queues.backgroundQueue().submit([&, item] {
+            if (item < BackgroundQueue::mostThreads)
+                together.arrive_and_wait();
+            EXPECT_TRUE(queues.backgroundQueue().isCurrent());
+            done.count_down();
+        });
+    }
+    EXPECT_EQ(threadsOfTheProcess() - threadsBefore, BackgroundQueue::mostThreads);
+    together.count_down();
+    done.wait();
+    EXPECT_FALSE(queues.backgroundQueue().isCurrent());
+}
+
+TEST_F(WorkQueuesTest, NoThreadIsStartedBeforeThereIsWorkForIt)
+{
+    const std::size_t threadsBefore = threadsOfTheProcess();
+    LinuxWorkQueues others;
+    EXPECT_EQ(threadsOfTheProcess(), threadsBefore);
+    const auto done = queues.makeSemaphore(0);
+    others.backgroundQueue().submit([&] { done->signal(); });
+    done->wait();
+    EXPECT_EQ(threadsOfTheProcess(), threadsBefore + 1);
+}
+
+TEST_F(WorkQueuesTest, BackgroundItemsMaySubmitAndAllRunBeforeTheQueueGoes)
+{
+    std::atomic<int> ran = 0;
+    {
+        BackgroundQueue queue;
+        for (int item = 0; item < 500; ++item) {
+            queue.submit([&] {
+                ++ran;
+                queue.submit([&] { ++ran; });
+            });
+        }
+    }
+    EXPECT_EQ(ran, 1000);
+}
+
+TEST_F(WorkQueuesTest, BackgroundItemsThatNoThreadCameForRunBeforeTheQueueGoes)
+{
+    const support::NoThreads none;
+    int ran = 0;
+    {
+        BackgroundQueue queue;
+        queue.submit([&] {
+            ++ran;
+            EXPECT_TRUE(queue.isCurrent());
+            queue.submit([&] { ++ran; });
+        });
+    }
+    EXPECT_EQ(ran, 2);
+}
+
+TEST_F(WorkQueuesTest, DelayedItemsFromManyThreadsAllRun)
+{
+    constexpr int items = 500;
+    const auto queue = makeQueue();
+    std::latch done(4 * items);
+    {
+        std::vector<std::jthread> threads;
+        for (int submitter = 0; submitter < 4; ++submitter) {
+            threads.emplace_back([&] {
+                for (int item = 0; item < items; ++item)
+                    queues.submitAfter(std::chrono::microseconds(item % 7 * 100), *queue, [&] { done.count_down(); });
+            });
+        }
+    }
+    done.wait();
+}
+
+TEST_F(WorkQueuesTest, WhatIsNotDueYetIsDroppedAndHoldsNothingUp)
+{
+    const auto queue = makeQueue();
+    auto held = std::make_shared<int>(1);
+    const std::weak_ptr<int> watched = held;
+    {
+        LinuxWorkQueues others;
+        others.submitAfter(24h, *queue, [held = std::move(held)] { ADD_FAILURE() << *held; });
+        others.submitAfter(std::chrono::nanoseconds::max(), *queue, [] { ADD_FAILURE(); });
+    }
+    EXPECT_TRUE(watched.expired());
+}
+
+TEST_F(WorkQueuesTest, SemaphoreWakesEveryoneItLetsThrough)
+{
+    constexpr int waiters = 8;
+    constexpr int rounds = 300;
+    const auto semaphore = queues.makeSemaphore(0);
+    std::atomic<int> passed = 0;
+    {
+        std::vector<std::jthread> threads;
+        for (int waiter = 0; waiter < waiters; ++waiter) {
+            threads.emplace_back([&] {
+                for (int round = 0; round < rounds; ++round) {
+                    semaphore->wait();
+                    ++passed;
+                }
+            });
+        }
+        for (int signals = 0; signals < waiters * rounds; ++signals)
+            semaphore->signal();
+    }
+    EXPECT_EQ(passed, waiters * rounds);
+}
+
+} // namespace
+} // namespace platform

@@ -1,0 +1,517 @@
+// That what is acknowledged is kept: with turns and without, by many threads, beyond the backlog, and when the
+// service is killed. The database is read as any program would read it.
+#include "platform/linux/store/AnalyticsStore.h"
+
+#include "platform/linux/queues/LinuxWorkQueues.h"
+#include "platform/linux/store/ManualClock.h"
+#include "platform/linux/store/StoreReader.h"
+#include "support/Sanitizers.h"
+#include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+
+#include <atomic>
+#include <chrono>
+#include <csignal>
+#include <fmt/format.h>
+#include <future>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
+#include <utility>
+
+namespace platform {
+namespace {
+
+using foundation::Dictionary;
+using support::StoreReader;
+using testing::ElementsAre;
+using testing::Field;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+namespace fs = std::filesystem;
+using namespace std::chrono_literals;
+
+constexpr const char* eventName = "com.quarn.kesto.Playback.Start";
+
+class AnalyticsStoreTest : public testing::Test {
+protected:
+    AnalyticsStore& store()
+    {
+        if (!store_)
+            store_ = std::make_unique<AnalyticsStore>(temporary.path(), watcher, clock, ProviderLog(log), limits);
+        return *store_;
+    }
+    void closeStore() { store_.reset(); }
+
+    void send(std::int64_t number, const char* name = eventName)
+    {
+        store().sendAnalyticsEventLazy(name, [number] { return Dictionary{{"n", number}}; });
+    }
+    // Sends from within a turn, and ends it the way the service does.
+    void runTurn(std::function<void()> items, AnalyticsStore::WhenKept whenKept)
+    {
+        std::promise<void> ended;
+        LinuxWorkQueues queues;
+        queues.setTurnEndHandler([&] {
+            store().endTurn(std::move(whenKept));
+            ended.set_value();
+        });
+        const auto queue = queues.makeSerialQueue("com.quarn.kesto.test", QualityOfService::UserInteractive);
+        queue->submit(std::move(items));
+        ended.get_future().wait();
+    }
+    // 120 events, which take so much that the log wants to be moved to the database.
+    void sendALongLog()
+    {
+        for (int number = 0; number < 120; ++number)
+            store().sendAnalyticsEventLazy(eventName, [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
+        store().flush();
+    }
+    [[nodiscard]] std::int64_t storedEvents() { return StoreReader(file).eventCount(); }
+
+    // Keeps the store's thread busy until it is released: nothing is written meanwhile.
+    class Hold {
+    public:
+        explicit Hold(AnalyticsStore& store)
+        {
+            std::promise<void> held;
+            store.sendAnalyticsEventLazy("com.quarn.hold", [] { return Dictionary(); });
+            store.endTurn([&held, released = released_.get_future()] {
+                held.set_value();
+                released.wait();
+            });
+            held.get_future().wait();
+        }
+        ~Hold() { release(); }
+        Hold(const Hold&) = delete;
+        Hold& operator=(const Hold&) = delete;
+        void release()
+        {
+            if (!std::exchange(isReleased_, true))
+                released_.set_value();
+        }
+
+    private:
+        std::promise<void> released_;
+        bool isReleased_ = false;
+    };
+
+    support::TemporaryDirectory temporary;
+    const fs::path file = temporary.path() / "analytics.sqlite3";
+    support::ManualClock clock;
+    support::FakeLog log;
+    ConfigurationWatcher watcher{temporary.path(), ProviderLog(log)};
+    AnalyticsStore::Limits limits;
+
+private:
+    std::unique_ptr<AnalyticsStore> store_;
+};
+
+TEST_F(AnalyticsStoreTest, StampsAnEventWithTheTimeAtWhichItWasSent)
+{
+    Hold hold(store());
+    clock.set(1'800'000'000.5);
+    send(1);
+    clock.set(1'900'000'000);
+    hold.release();
+    store().flush();
+    EXPECT_EQ(StoreReader(file).texts("SELECT time FROM events WHERE name LIKE '%Start'"),
+              std::vector<std::string>{"1800000000.5"});
+}
+
+TEST_F(AnalyticsStoreTest, BuildsThePayloadOnceAndWhenTheEventIsSent)
+{
+    int built = 0;
+    const auto sender = std::this_thread::get_id();
+    store().sendAnalyticsEventLazy(eventName, [&] {
+        ++built;
+        EXPECT_EQ(std::this_thread::get_id(), sender);
+        return Dictionary{{"key", "value"}};
+    });
+    EXPECT_EQ(built, 1);
+    store().flush();
+    EXPECT_EQ(built, 1);
+    EXPECT_EQ(StoreReader(file).text("SELECT payload FROM events"), "{\"key\":\"value\"}");
+}
+
+TEST_F(AnalyticsStoreTest, TheDatabaseIsThereBeforeTheFirstEvent)
+{
+    store();
+    closeStore();
+    EXPECT_EQ(storedEvents(), 0);
+}
+
+TEST_F(AnalyticsStoreTest, DestroyingTheStoreKeepsWhatWasSent)
+{
+    for (int number = 0; number < 1000; ++number)
+        send(number);
+    closeStore();
+    EXPECT_EQ(storedEvents(), 1000);
+}
+
+TEST_F(AnalyticsStoreTest, AnEventOutsideATurnIsKeptWithoutAnybodyAsking)
+{
+    send(1);
+    const auto deadline = std::chrono::steady_clock::now() + 20s;
+    while (store().keptEvents() == 0 && std::chrono::steady_clock::now() < deadline)
+        std::this_thread::yield();
+    EXPECT_EQ(storedEvents(), 1);
+}
+
+// --- Turns
+
+TEST_F(AnalyticsStoreTest, ATurnIsKeptBeforeItIsAcknowledged)
+{
+    for (std::int64_t turn = 1; turn <= 50; ++turn) {
+        std::promise<std::int64_t> stored;
+        runTurn([&] { send(turn); }, [&] { stored.set_value(storedEvents()); });
+        ASSERT_EQ(stored.get_future().get(), turn);
+    }
+}
+
+TEST_F(AnalyticsStoreTest, WhatATurnSentIsNotWrittenBeforeItsEnd)
+{
+    store().flush();
+    runTurn(
+        [&] {
+            send(1);
+            store().sendAnalyticsEventLazy(eventName, [&] { return Dictionary{{"n", 2}}; });
+            // The store's thread is asked to write something else meanwhile.
+            std::thread([&] {
+                send(3, "com.quarn.other");
+                while (store().keptEvents() == 0)
+                    std::this_thread::yield();
+            }).join();
+            EXPECT_EQ(StoreReader(file).texts("SELECT name FROM events"), std::vector<std::string>{"com.quarn.other"});
+        },
+        {});
+    store().flush();
+    EXPECT_EQ(storedEvents(), 3);
+}
+
+TEST_F(AnalyticsStoreTest, ATurnThatSentNothingIsAcknowledgedHereAndNow)
+{
+    std::thread::id acknowledgedOn;
+    store().endTurn([&] { acknowledgedOn = std::this_thread::get_id(); });
+    EXPECT_EQ(acknowledgedOn, std::this_thread::get_id());
+}
+
+TEST_F(AnalyticsStoreTest, ATurnThatSentNothingDoesNotOvertakeOneThatDid)
+{
+    std::vector<int> order;
+    std::promise<void> last;
+    {
+        Hold hold(store());
+        send(1);
+        store().endTurn([&] { order.push_back(1); });
+        store().endTurn([&] { order.push_back(2); });
+        send(2);
+        store().endTurn([&] { order.push_back(3); });
+        store().endTurn([&] {
+            order.push_back(4);
+            last.set_value();
+        });
+        EXPECT_THAT(order, IsEmpty());
+    }
+    last.get_future().wait();
+    EXPECT_THAT(order, ElementsAre(1, 2, 3, 4));
+}
+
+TEST_F(AnalyticsStoreTest, ATurnThatNobodyWaitsForIsKeptToo)
+{
+    runTurn([&] { send(1); }, {});
+    store().endTurn({});
+    store().flush();
+    EXPECT_EQ(storedEvents(), 1);
+}
+
+TEST_F(AnalyticsStoreTest, TurnsThatGatherDuringACommitAreOneTransaction)
+{
+    // A reader sees all of them or none of them.
+    Hold hold(store());
+    for (int turn = 0; turn < 10; ++turn) {
+        send(turn);
+        store().endTurn([this] { EXPECT_EQ(storedEvents(), 11); });
+    }
+    EXPECT_EQ(storedEvents(), 1);
+    hold.release();
+    store().flush();
+}
+
+TEST_F(AnalyticsStoreTest, ManyTurnsAndManyOtherThreadsLoseNothingAndKeepTheirOrder)
+{
+    constexpr int turns = 500;
+    constexpr int others = 3;
+    std::atomic<int> acknowledged = 0;
+    store();
+    {
+        LinuxWorkQueues queues;
+        queues.setTurnEndHandler([&] {
+            store().endTurn([&, expected = store().keptEvents()] {
+                EXPECT_GE(store().keptEvents(), expected);
+                ++acknowledged;
+            });
+        });
+        const auto queue = queues.makeSerialQueue("com.quarn.kesto.test", QualityOfService::UserInteractive);
+        std::vector<std::jthread> threads;
+        for (int thread = 0; thread < others; ++thread)
+            threads.emplace_back([this, thread] {
+                const std::string name = fmt::format("com.quarn.thread{}", thread);
+                for (int number = 0; number < turns; ++number)
+                    send(number, name.c_str());
+            });
+        for (int turn = 0; turn < turns; ++turn)
+            queue->submit([this, turn] {
+                send(2 * turn);
+                send(2 * turn + 1);
+            });
+    }
+    store().flush();
+    EXPECT_GT(acknowledged, 0);
+    StoreReader reader(file);
+    EXPECT_EQ(reader.eventCount(), (2 + others) * turns);
+    // In each sender's order.
+    EXPECT_EQ(
+        reader.number("SELECT count(*) FROM (SELECT payload ->> 'n' AS n, lag(payload ->> 'n') OVER (PARTITION BY "
+                      "name ORDER BY id) AS before FROM events) WHERE before >= n"),
+        0);
+}
+
+TEST_F(AnalyticsStoreTest, FlushMayBeCalledFromAnyThread)
+{
+    store();
+    std::vector<std::jthread> threads;
+    for (int thread = 0; thread < 4; ++thread)
+        threads.emplace_back([this] {
+            for (int number = 0; number < 20; ++number) {
+                const std::uint64_t before = store().keptEvents();
+                send(number);
+                store().flush();
+                EXPECT_GT(store().keptEvents(), before);
+            }
+        });
+}
+
+// --- The backlog
+
+TEST_F(AnalyticsStoreTest, TooManyEventsMakeTheSenderWaitUntilThereIsRoom)
+{
+    limits = {.mostEvents = 10, .mostBytes = 1 << 20};
+    std::atomic<int> sent = 0;
+    std::jthread sender;
+    {
+        Hold hold(store());
+        sender = std::jthread([&] {
+            for (; sent < 100; ++sent)
+                send(sent);
+        });
+        while (sent < 9)
+            std::this_thread::yield();
+        EXPECT_LE(sent, 10);
+    }
+    sender.join();
+    store().flush();
+    EXPECT_EQ(storedEvents(), 101);
+}
+
+TEST_F(AnalyticsStoreTest, TooManyBytesMakeTheEndOfATurnWait)
+{
+    limits = {.mostEvents = 1000, .mostBytes = 100'000};
+    std::promise<void> ended;
+    std::jthread sender;
+    {
+        Hold hold(store());
+        sender = std::jthread([&] {
+            runTurn(
+                [&] {
+                    store().sendAnalyticsEventLazy(eventName,
+                                                   [] { return Dictionary{{"text", std::string(99'000, 'x')}}; });
+                    store().sendAnalyticsEventLazy(eventName,
+                                                   [] { return Dictionary{{"text", std::string(99'000, 'y')}}; });
+                },
+                {});
+            ended.set_value();
+        });
+        auto waiting = ended.get_future();
+        EXPECT_EQ(waiting.wait_for(50ms), std::future_status::timeout);
+    }
+    sender.join();
+    store().flush();
+    EXPECT_EQ(storedEvents(), 3);
+}
+
+TEST_F(AnalyticsStoreTest, APayloadThatTwoEventsShareCountsOnce)
+{
+    limits = {.mostEvents = 1000, .mostBytes = 100'000};
+    Hold hold(store());
+    const Dictionary payload{{"text", std::string(60'000, 'x')}};
+    send(1);
+    for (int number = 0; number < 2; ++number) // if both counted, the second would wait for ever
+        store().sendAnalyticsEventLazy(eventName, [&] { return payload; });
+}
+
+TEST_F(AnalyticsStoreTest, ATurnLargerThanTheBacklogIsKeptWhole)
+{
+    limits = {.mostEvents = 10, .mostBytes = 1 << 20};
+    std::promise<std::int64_t> stored;
+    runTurn(
+        [&] {
+            for (int number = 0; number < 1000; ++number)
+                send(number);
+        },
+        [&] { stored.set_value(storedEvents()); });
+    EXPECT_EQ(stored.get_future().get(), 1000);
+}
+
+TEST_F(AnalyticsStoreTest, EndsWhileItWaitsForAQuietMoment)
+{
+    sendALongLog();
+    closeStore();
+    EXPECT_EQ(storedEvents(), 120);
+}
+
+TEST_F(AnalyticsStoreTest, ALongLogIsMovedToTheDatabaseOnceItIsQuiet)
+{
+    constexpr std::uintmax_t megabyte = 1024 * 1024;
+    sendALongLog();
+    for (int tries = 0; tries < 1000 && fs::file_size(file) < 8 * megabyte; ++tries)
+        std::this_thread::sleep_for(10ms);
+    EXPECT_GT(fs::file_size(file), 8 * megabyte);
+    EXPECT_EQ(storedEvents(), 120);
+}
+
+// --- The death of the service
+
+TEST_F(AnalyticsStoreTest, KillingTheServiceLosesNothingThatWasAcknowledged)
+{
+    for (int round = 0; round < 5; ++round) {
+        int channel[2] = {};
+        ASSERT_EQ(::pipe(channel), 0);
+        const fs::path directory = temporary.path() / std::to_string(round);
+        fs::create_directory(directory);
+        const pid_t service = ::fork();
+        if (service == 0) {
+            ConfigurationWatcher childsWatcher(directory, ProviderLog(log));
+            AnalyticsStore childsStore(directory, childsWatcher, clock, ProviderLog(log));
+            for (std::int64_t turn = 1;; ++turn) {
+                childsStore.sendAnalyticsEventLazy(eventName, [turn] { return Dictionary{{"n", turn}}; });
+                childsStore.endTurn([turn, &channel] {
+                    if (::write(channel[1], &turn, sizeof turn) != sizeof turn)
+                        ::_exit(1);
+                });
+            }
+        }
+        ::close(channel[1]);
+        std::int64_t acknowledged = 0;
+        while (acknowledged < 50 * (round + 1))
+            ASSERT_EQ(::read(channel[0], &acknowledged, sizeof acknowledged),
+                      static_cast<ssize_t>(sizeof acknowledged));
+        ::kill(service, SIGKILL);
+        while (::read(channel[0], &acknowledged, sizeof acknowledged) == static_cast<ssize_t>(sizeof acknowledged)) { }
+        ::waitpid(service, nullptr, 0);
+        ::close(channel[0]);
+
+        StoreReader reader(directory / "analytics.sqlite3");
+        EXPECT_GE(reader.number("SELECT max(payload ->> 'n') FROM events"), acknowledged);
+        EXPECT_EQ(reader.number("SELECT max(id) - count(*) FROM events"), 0);
+        EXPECT_EQ(reader.text("PRAGMA integrity_check"), "ok");
+    }
+}
+
+// --- Configuration
+
+template <typename Condition> bool becomesTrue(Condition condition)
+{
+    const auto deadline = std::chrono::steady_clock::now() + 20s;
+    while (!condition()) {
+        if (std::chrono::steady_clock::now() > deadline)
+            return false;
+        std::this_thread::yield();
+    }
+    return true;
+}
+
+TEST_F(AnalyticsStoreTest, TheServicesOwnEventsAreUsedUnlessSaidOtherwise)
+{
+    EXPECT_TRUE(store().isAnalyticsEventUsed("com.quarn.kesto.Playback.Start"));
+    EXPECT_TRUE(store().isAnalyticsEventUsed("com.quarn.telephony.IO.Error"));
+    EXPECT_FALSE(store().isAnalyticsEventUsed("org.example.other"));
+}
+
+TEST_F(AnalyticsStoreTest, WhichEventsAreUsedMayChangeWhileTheServiceRuns)
+{
+    EXPECT_TRUE(store().isAnalyticsEventUsed(eventName));
+    support::replaceFile(temporary.path() / "analytics.toml", "used = [\"com.quarn.telephony.*\"]");
+    EXPECT_TRUE(becomesTrue([&] { return !store().isAnalyticsEventUsed(eventName); }));
+    EXPECT_TRUE(store().isAnalyticsEventUsed("com.quarn.telephony.IO.Error"));
+    support::replaceFile(temporary.path() / "analytics.toml", "used = []");
+    EXPECT_TRUE(becomesTrue([&] { return !store().isAnalyticsEventUsed("com.quarn.telephony.IO.Error"); }));
+    fs::remove(temporary.path() / "analytics.toml");
+    EXPECT_TRUE(becomesTrue([&] { return store().isAnalyticsEventUsed(eventName); }));
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(AnalyticsStoreTest, ABrokenConfigurationLeavesTheLastInForce)
+{
+    support::writeFile(temporary.path() / "analytics.toml", "used = [\"a.*\"]");
+    EXPECT_TRUE(store().isAnalyticsEventUsed("a.x"));
+    support::replaceFile(temporary.path() / "analytics.toml", "used = [");
+    EXPECT_TRUE(becomesTrue([&] { return !log.lines().empty(); }));
+    EXPECT_TRUE(store().isAnalyticsEventUsed("a.x"));
+    EXPECT_FALSE(store().isAnalyticsEventUsed(eventName));
+}
+
+TEST_F(AnalyticsStoreTest, AWrongValueIsToldWithItsFile)
+{
+    support::writeFile(temporary.path() / "analytics.toml", "maximum_age_days = -1");
+    store().flush();
+    EXPECT_THAT(log.take(),
+                ElementsAre(support::IsLine(LogLevel::Error, "kerl",
+                                            (temporary.path() / "analytics.toml").string()
+                                                + ": maximum_age_days = -1 should be a number of days above 0; the "
+                                                  "default counts until this is corrected")));
+}
+
+TEST_F(AnalyticsStoreTest, NewBoundsAreAppliedWithoutAnotherEvent)
+{
+    clock.set(100 * 86400);
+    send(1);
+    store().flush();
+    clock.set(150 * 86400);
+    support::writeFile(temporary.path() / "analytics.toml", "maximum_age_days = 10");
+    EXPECT_TRUE(becomesTrue([&] { return storedEvents() == 0; }));
+}
+
+TEST_F(AnalyticsStoreTest, AnIdleStoreDoesNotWake)
+{
+    KESTO_SKIP_WHERE_THREADS_ARE_WATCHED();
+    send(1);
+    store().flush();
+    // Of all threads of this process but this one, since the switch of a thread is counted when it wakes.
+    const auto switches = [] {
+        std::uint64_t sum = 0;
+        for (const auto& task : fs::directory_iterator("/proc/self/task")) {
+            if (task.path().filename() == std::to_string(::gettid()))
+                continue;
+            std::istringstream status(support::readFile(task.path() / "status"));
+            for (std::string line; std::getline(status, line);)
+                if (line.starts_with("voluntary_ctxt_switches:"))
+                    sum += std::stoull(line.substr(line.find(':') + 1));
+        }
+        return sum;
+    };
+    EXPECT_TRUE(becomesTrue([&] { // until both threads sleep
+        const std::uint64_t before = switches();
+        ::usleep(100'000);
+        return switches() == before;
+    }));
+    const std::uint64_t before = switches();
+    ::usleep(500'000);
+    EXPECT_EQ(switches(), before);
+}
+
+} // namespace
+} // namespace platform

@@ -1,0 +1,779 @@
+// The database on disks that are full, read-only or damaged, with readers and other writers beside it, and within
+// its bounds: events may be lost, and are counted; the service never is.
+#include "platform/linux/store/EventWriter.h"
+
+#include "platform/linux/store/ManualClock.h"
+#include "platform/linux/store/StoreReader.h"
+#include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+
+#include <cerrno>
+#include <csignal>
+#include <cstring>
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+#include <limits>
+#include <sys/mount.h>
+#include <sys/resource.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <thread>
+#include <unistd.h>
+
+namespace platform {
+namespace {
+
+using foundation::Dictionary;
+using support::LogLine;
+using support::StoreReader;
+using testing::AllOf;
+using testing::Each;
+using testing::ElementsAre;
+using testing::Field;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::SizeIs;
+using testing::StartsWith;
+
+namespace fs = std::filesystem;
+
+constexpr std::uint64_t megabyte = 1024 * 1024;
+
+struct AnalyticsEvent {
+    double time = 0;
+    std::string name;
+    Dictionary payload;
+};
+
+AnalyticsEvent event(double time, std::string name = "com.quarn.kesto.Playback.Start",
+                     Dictionary payload = {{"key", 1}})
+{
+    return {time, std::move(name), std::move(payload)};
+}
+
+std::vector<AnalyticsEvent> events(std::size_t count, std::size_t payloadSize = 300, double time = 1'800'000'000)
+{
+    const Dictionary payload{{"text", std::string(payloadSize, 'x')}};
+    return std::vector<AnalyticsEvent>(count, event(time, "com.quarn.kesto.Playback.Start", payload));
+}
+
+class EventWriterTest : public testing::Test {
+protected:
+    EventWriter& writer()
+    {
+        if (!writer_) {
+            writer_ = std::make_unique<EventWriter>(directory, clock, ProviderLog(log));
+            writer_->setConfiguration(configuration);
+        }
+        return *writer_;
+    }
+    void closeWriter() { writer_.reset(); }
+    static void keepIn(EventWriter& writer, const std::vector<AnalyticsEvent>& given)
+    {
+        EventBatch batch;
+        for (const auto& [time, name, payload] : given)
+            batch.add(time, name, payload);
+        writer.keep(batch);
+    }
+    void keep(const std::vector<AnalyticsEvent>& given) { keepIn(writer(), given); }
+    void maintain(bool isQuiet = true)
+    {
+        while (writer().maintain(isQuiet)) { }
+    }
+    std::uint64_t logBytes() const { return fs::file_size(directory / "analytics.sqlite3-wal"); }
+    [[nodiscard]] std::vector<std::string> filesNamed(std::string_view part) const
+    {
+        std::vector<std::string> names;
+        for (const auto& file : fs::directory_iterator(directory))
+            if (const std::string name = file.path().filename(); name.find(part) != std::string::npos)
+                names.push_back(name);
+        std::ranges::sort(names);
+        return names;
+    }
+    std::uint64_t lost(StoreError reason) { return writer().losses().count(reason); }
+
+    support::TemporaryDirectory temporary;
+    fs::path directory = temporary.path();
+    fs::path file() const { return directory / "analytics.sqlite3"; }
+    support::ManualClock clock;
+    support::FakeLog log;
+    AnalyticsConfiguration configuration;
+
+private:
+    std::unique_ptr<EventWriter> writer_;
+};
+
+// --- The database
+
+TEST_F(EventWriterTest, TheSchemaIsTheOneThatIsPromised)
+{
+    writer().open();
+    StoreReader reader(file());
+    EXPECT_EQ(
+        reader.text("SELECT sql FROM sqlite_schema WHERE name = 'events'"),
+        "CREATE TABLE events(id INTEGER PRIMARY KEY AUTOINCREMENT, time REAL NOT NULL, name TEXT NOT NULL, payload "
+        "TEXT NOT NULL) STRICT");
+    EXPECT_EQ(reader.number("PRAGMA user_version"), 1);
+    EXPECT_EQ(reader.text("PRAGMA journal_mode"), "wal");
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(EventWriterTest, KeepsEventsInTheirOrder)
+{
+    keep({event(1'800'000'000.25, "a", {{"n", 1}, {"text", "x\"y\n"}}), event(1'700'000'000, "b", {})});
+    keep({event(1'800'000'001, "c", {{"yes", true}, {"share", 0.6F}})});
+    StoreReader reader(file());
+    EXPECT_THAT(reader.texts("SELECT id || ' ' || time || ' ' || name || ' ' || payload FROM events ORDER BY id"),
+                ElementsAre("1 1800000000.25 a {\"n\":1,\"text\":\"x\\\"y\\n\"}", "2 1700000000.0 b {}",
+                            "3 1800000001.0 c {\"yes\":true,\"share\":0.6}"));
+    EXPECT_EQ(writer().keptEvents(), 3U);
+}
+
+TEST_F(EventWriterTest, NumbersOfRowsOnEverySideOfTheStatementsSize)
+{
+    std::int64_t expected = 0;
+    for (const std::size_t count : {1U, 15U, 16U, 17U, 31U, 32U, 33U, 100U}) {
+        std::vector<AnalyticsEvent> given;
+        for (std::size_t number = 0; number < count; ++number)
+            given.push_back(event(1, "a", {{"n", number}}));
+        keep(given);
+        expected += static_cast<std::int64_t>(count);
+        StoreReader reader(file());
+        ASSERT_EQ(reader.eventCount(), expected);
+        ASSERT_EQ(reader.number(fmt::format("SELECT count(DISTINCT payload) FROM events WHERE id > {}",
+                                            expected - static_cast<std::int64_t>(count))),
+                  static_cast<std::int64_t>(count));
+    }
+}
+
+TEST_F(EventWriterTest, TwoEventsOfOnePayloadBothHaveIt)
+{
+    const Dictionary shared{{"n", 1}};
+    keep({event(1, "a", shared), event(1, "b", shared), event(1, "c", {{"n", 2}}), event(1, "d", shared)});
+    StoreReader reader(file());
+    EXPECT_THAT(reader.texts("SELECT name || payload FROM events ORDER BY id"),
+                ElementsAre("a{\"n\":1}", "b{\"n\":1}", "c{\"n\":2}", "d{\"n\":1}"));
+}
+
+TEST_F(EventWriterTest, NumbersAreNeverUsedTwice)
+{
+    keep({event(1), event(2)});
+    configuration.maximumAgeDays = 1;
+    writer().setConfiguration(configuration);
+    maintain();
+    closeWriter();
+    keep({event(3)});
+    EXPECT_EQ(StoreReader(file()).text("SELECT id FROM events"), "3");
+}
+
+TEST_F(EventWriterTest, GoesOnWithTheDatabaseThatIsThere)
+{
+    keep({event(1, "a")});
+    closeWriter();
+    keep({event(2, "b")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("a", "b"));
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(EventWriterTest, AnEmptyFileIsANewDatabase)
+{
+    support::writeFile(file(), "");
+    keep({event(1)});
+    EXPECT_EQ(StoreReader(file()).eventCount(), 1);
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(EventWriterTest, WhatJsonCannotSayIsLostAndNothingElse)
+{
+    const double infinity = std::numeric_limits<double>::infinity();
+    keep({event(1, "a"), event(1, "b", {{"n", infinity}}), event(1, "c", {{"n", foundation::Array{1, -infinity}}}),
+          event(1, "d", {{"n", std::numeric_limits<float>::quiet_NaN()}}), event(1, "e")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name || payload FROM events ORDER BY id"),
+                ElementsAre("a{\"key\":1}", "e{\"key\":1}"));
+    EXPECT_EQ(lost(StoreError::NotJson), 3U);
+    EXPECT_EQ(writer().keptEvents(), 2U);
+    EXPECT_THAT(log.take(),
+                ElementsAre(support::IsLine(LogLevel::Error, "kerl",
+                                            "3 analytics events were lost (3 since the start): " + file().string()
+                                                + ": their payloads hold NaN or infinity, which JSON cannot say; "
+                                                  "correct the programs that send them")));
+}
+
+TEST_F(EventWriterTest, AnEventAfterOneThatIsNotJsonDoesNotGetItsPayload)
+{
+    const Dictionary bad{{"n", std::numeric_limits<double>::quiet_NaN()}};
+    keep({event(1, "a", bad), event(1, "b", bad), event(1, "c", {{"n", 1}})});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name || payload FROM events"), ElementsAre("c{\"n\":1}"));
+    EXPECT_EQ(lost(StoreError::NotJson), 2U);
+}
+
+TEST_F(EventWriterTest, FullSynchronizationIsSetAndTakenBack)
+{
+    configuration.synchronization = StoreSynchronization::Full;
+    keep({event(1)});
+    configuration.synchronization = StoreSynchronization::Normal;
+    writer().setConfiguration(configuration);
+    keep({event(2)});
+    EXPECT_EQ(StoreReader(file()).eventCount(), 2);
+}
+
+TEST_F(EventWriterTest, ALongPayloadIsKeptWhole)
+{
+    const std::string text(3'000'000, 'x');
+    keep({event(1, "a", {{"text", text}}), event(2, "b")});
+    EXPECT_EQ(StoreReader(file()).number("SELECT length(payload ->> 'text') FROM events WHERE id = 1"), 3'000'000);
+}
+
+// --- A database that is none, or damaged, or newer
+
+TEST_F(EventWriterTest, AFileThatIsNoDatabaseIsSetAside)
+{
+    support::writeFile(file(), std::string(5000, 'x'));
+    clock.set(1'800'000'000);
+    keep({event(1)});
+    EXPECT_EQ(StoreReader(file()).eventCount(), 1);
+    const fs::path aside = file().string() + ".corrupt-20270115T080000Z";
+    EXPECT_EQ(support::readFile(aside), std::string(5000, 'x'));
+    EXPECT_THAT(log.take(),
+                ElementsAre(support::IsLine(LogLevel::Error, "kerl",
+                                            file().string() + " is damaged or no database of events; it is now "
+                                                + aside.string() + ", and a new one is begun")));
+}
+
+TEST_F(EventWriterTest, ADatabaseOfSomethingElseIsSetAside)
+{
+    for (const char* sql :
+         {"CREATE TABLE other(a)", "CREATE TABLE events(a); PRAGMA user_version = 1", "PRAGMA user_version = 1",
+          "PRAGMA user_version = -3", "CREATE TABLE events(id, time, name, payload)"}) {
+        closeWriter();
+        fs::remove(file());
+        sqlite3* connection = nullptr;
+        ASSERT_EQ(::sqlite3_open(file().c_str(), &connection), SQLITE_OK);
+        ASSERT_EQ(::sqlite3_exec(connection, sql, nullptr, nullptr, nullptr), SQLITE_OK);
+        ::sqlite3_close(connection);
+        clock.advance(1);
+        keep({event(1)});
+        EXPECT_EQ(StoreReader(file()).eventCount(), 1) << sql;
+        EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("no database of events")))) << sql;
+    }
+}
+
+TEST_F(EventWriterTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
+{
+    keep(events(5000));
+    closeWriter();
+    {
+        // All pages but the first are rubbish.
+        std::fstream damaged(file(), std::ios::in | std::ios::out | std::ios::binary);
+        const auto size = static_cast<std::streamsize>(fs::file_size(file()));
+        damaged.seekp(4096);
+        const std::string rubbish(static_cast<std::size_t>(size - 4096), '\x5a');
+        damaged.write(rubbish.data(), static_cast<std::streamsize>(rubbish.size()));
+    }
+    keep({event(1, "after")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events"), ElementsAre("after"));
+    EXPECT_EQ(writer().keptEvents(), 1U);
+    EXPECT_THAT(filesNamed(".corrupt-"), SizeIs(3)); // with the log and its index
+    EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("is damaged or no database of events"))));
+}
+
+TEST_F(EventWriterTest, OnlySoManyDamagedDatabasesAreKept)
+{
+    for (int number = 0; number < 6; ++number) {
+        closeWriter();
+        fs::remove(directory / "analytics.sqlite3-wal");
+        support::writeFile(file(), "damaged " + std::to_string(number));
+        clock.advance(60);
+        keep({event(1)});
+    }
+    std::vector<std::string> contents;
+    for (const std::string& name : filesNamed(".corrupt-"))
+        if (!name.ends_with("-wal") && !name.ends_with("-shm"))
+            contents.push_back(support::readFile(directory / name));
+    EXPECT_THAT(contents, ElementsAre("damaged 3", "damaged 4", "damaged 5"));
+}
+
+TEST_F(EventWriterTest, TwoDamagedDatabasesOfOneMomentAreBothKept)
+{
+    for (const char* text : {"first", "second"}) {
+        closeWriter();
+        support::writeFile(file(), text);
+        keep({event(1)});
+    }
+    std::vector<std::string> contents;
+    for (const std::string& name : filesNamed(".corrupt-"))
+        contents.push_back(support::readFile(directory / name));
+    EXPECT_THAT(contents, testing::IsSupersetOf({"first", "second"}));
+}
+
+TEST_F(EventWriterTest, ANewerDatabaseIsSetAsideUntouched)
+{
+    keep({event(1)});
+    closeWriter();
+    {
+        sqlite3* connection = nullptr;
+        ASSERT_EQ(::sqlite3_open(file().c_str(), &connection), SQLITE_OK);
+        ASSERT_EQ(
+            ::sqlite3_exec(connection, "CREATE TABLE more(a); PRAGMA user_version = 2", nullptr, nullptr, nullptr),
+            SQLITE_OK);
+        ::sqlite3_close(connection);
+    }
+    keep({event(2, "mine")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events"), ElementsAre("mine"));
+    const auto aside = filesNamed(".newer-");
+    ASSERT_THAT(aside, Not(IsEmpty()));
+    StoreReader newer(directory / aside.front());
+    EXPECT_EQ(newer.number("PRAGMA user_version"), 2);
+    EXPECT_EQ(newer.eventCount(), 1);
+    EXPECT_THAT(log.take(),
+                ElementsAre(Field(&LogLine::message, HasSubstr("was made by a later version of the service"))));
+}
+
+TEST_F(EventWriterTest, ADatabaseThatIsTakenAwayIsBegunAnew)
+{
+    keep({event(1, "a")});
+    fs::remove(file());
+    keep({event(2, "b")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events"), ElementsAre("b"));
+    EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("was taken away"))));
+}
+
+TEST_F(EventWriterTest, ADatabaseThatIsPutInItsPlaceIsGoneOnWith)
+{
+    keep({event(1, "a")});
+    closeWriter();
+    fs::copy_file(file(), directory / "copy");
+    keep({event(2, "b")});
+    fs::rename(directory / "copy", file());
+    fs::remove(directory / "analytics.sqlite3-wal");
+    keep({event(3, "c")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("a", "c"));
+}
+
+TEST_F(EventWriterTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
+{
+    keep({event(1, "first")});
+    EventWriter second(directory, clock, ProviderLog(log));
+    second.open();
+    EXPECT_THAT(log.take(),
+                ElementsAre(Field(&LogLine::message,
+                                  AllOf(StartsWith("analytics events cannot be kept: "),
+                                        HasSubstr("another process keeps its events in the same directory; "
+                                                  "give each service its own state directory")))));
+    const std::vector<AnalyticsEvent> given{event(2, "second")};
+    keepIn(second, given);
+    EXPECT_EQ(second.losses().count(StoreError::InUse), 1U);
+    closeWriter();
+    clock.advance(EventWriter::secondsBetweenOpenings);
+    keepIn(second, given);
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("first", "second"));
+}
+
+// --- Disks that fail
+
+// Runs the test as an ordinary user, in a process of its own, since privileges are not got back.
+template <typename Test> void runUnprivileged(const fs::path& owned, Test test)
+{
+    const pid_t child = ::fork();
+    if (child == 0) {
+        constexpr unsigned nobody = 65534;
+        const bool isOrdinary = ::getuid() != 0
+            || (::chown(owned.c_str(), nobody, nobody) == 0 && ::setgid(nobody) == 0 && ::setuid(nobody) == 0);
+        if (isOrdinary)
+            test();
+        ::_exit(!isOrdinary ? 2 : testing::Test::HasFailure() ? 1 : 0);
+    }
+    int status = 0;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, 0);
+}
+
+TEST_F(EventWriterTest, AReadOnlyDirectoryLosesEventsAndRecovers)
+{
+    runUnprivileged(directory, [this] {
+        ::chmod(directory.c_str(), 0555);
+        keep({event(1), event(2)});
+        EXPECT_EQ(lost(StoreError::CannotOpen), 2U);
+        EXPECT_THAT(log.take(),
+                    ElementsAre(Field(&LogLine::message,
+                                      AllOf(StartsWith("2 analytics events were lost (2 since the start): "),
+                                            HasSubstr("let the user of the service write")))));
+        ::chmod(directory.c_str(), 0755);
+        keep({event(3)});
+        EXPECT_EQ(lost(StoreError::CannotOpen), 3U); // it is not tried again with every event
+        clock.advance(EventWriter::secondsBetweenOpenings);
+        keep({event(4)});
+        EXPECT_EQ(StoreReader(file()).eventCount(), 1);
+    });
+}
+
+TEST_F(EventWriterTest, AReadOnlyDatabaseLosesEventsAndRecovers)
+{
+    runUnprivileged(directory, [this] {
+        keep({event(1)});
+        closeWriter();
+        ::chmod(file().c_str(), 0444);
+        keep({event(2)});
+        EXPECT_EQ(lost(StoreError::ReadOnly), 1U);
+        EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("the database is read-only"))));
+        ::chmod(file().c_str(), 0644);
+        clock.advance(EventWriter::secondsBetweenOpenings);
+        keep({event(3)});
+        EXPECT_EQ(StoreReader(file()).eventCount(), 2);
+    });
+}
+
+TEST_F(EventWriterTest, WithoutWriteAccessAnybodyReadsWhatTheServiceLeft)
+{
+    if (::getuid() != 0)
+        GTEST_SKIP() << "only a privileged user can become one without write access";
+    keep(events(100));
+    closeWriter();
+    ::chmod(directory.c_str(), 0755);
+    for (const auto& each : fs::directory_iterator(directory))
+        ::chmod(each.path().c_str(), 0644);
+    const pid_t child = ::fork();
+    if (child == 0) {
+        if (::setgid(65534) != 0 || ::setuid(65534) != 0)
+            ::_exit(2);
+        try {
+            ::_exit(StoreReader(file()).eventCount() == 100 ? 0 : 1);
+        } catch (const std::exception&) {
+            ::_exit(3);
+        }
+    }
+    int status = 0;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, 0);
+}
+
+TEST_F(EventWriterTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
+{
+    const fs::path small = directory / "small";
+    fs::create_directory(small);
+    if (::mount("tmpfs", small.c_str(), "tmpfs", 0, "size=2m") != 0)
+        GTEST_SKIP() << "a small disk cannot be mounted here: " << std::strerror(errno);
+    directory = small;
+    keep(events(100));
+    support::writeFile(small / "ballast", std::string(8 * megabyte, 'x'));
+    std::uint64_t given = 100;
+    for (int round = 0; round < 20; ++round, given += 100)
+        keep(events(100));
+    const std::uint64_t lostEvents = lost(StoreError::DiskFull);
+    EXPECT_GT(lostEvents, 0U);
+    EXPECT_EQ(lostEvents % 100, 0U); // whole transactions
+    EXPECT_EQ(writer().keptEvents() + lostEvents, given);
+    EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(writer().keptEvents()));
+    EXPECT_THAT(log.take(),
+                ElementsAre(Field(&LogLine::message,
+                                  AllOf(StartsWith("100 analytics events were lost (100 since the start): "),
+                                        HasSubstr("the disk is full; make room, or lower maximum_size_mb")))));
+
+    fs::remove(small / "ballast");
+    keep(events(100));
+    EXPECT_EQ(lost(StoreError::DiskFull), lostEvents);
+    EXPECT_EQ(StoreReader(file()).text("PRAGMA integrity_check"), "ok");
+    closeWriter();
+    EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(given + 100 - lostEvents));
+    directory = temporary.path();
+    ::umount2(small.c_str(), MNT_DETACH);
+}
+
+TEST_F(EventWriterTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
+{
+    const pid_t child = ::fork();
+    if (child == 0) {
+        ::signal(SIGXFSZ, SIG_IGN);
+        const auto limitFiles = [](rlim_t bytes) {
+            rlimit limit{};
+            ::getrlimit(RLIMIT_FSIZE, &limit);
+            limit.rlim_cur = bytes;
+            ::setrlimit(RLIMIT_FSIZE, &limit);
+        };
+        keep(events(10));
+        limitFiles(200'000);
+        for (int round = 0; round < 10; ++round)
+            keep(events(200));
+        EXPECT_GT(lost(StoreError::DiskFull), 0U);
+        EXPECT_EQ(writer().keptEvents() + lost(StoreError::DiskFull), 2010U);
+        limitFiles(RLIM_INFINITY);
+        const std::uint64_t before = writer().keptEvents();
+        keep(events(200));
+        EXPECT_EQ(writer().keptEvents(), before + 200);
+        EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(before + 200));
+        ::_exit(HasFailure() ? 1 : 0);
+    }
+    int status = 0;
+    ASSERT_EQ(::waitpid(child, &status, 0), child);
+    EXPECT_EQ(status, 0);
+}
+
+TEST_F(EventWriterTest, LossesAreToldAtOnceAndThenOnceAMinute)
+{
+    const Dictionary bad{{"n", std::numeric_limits<double>::quiet_NaN()}};
+    const auto lose = [&](std::size_t count) { keep(std::vector<AnalyticsEvent>(count, event(1, "a", bad))); };
+    const auto told = [&](std::string_view beginning) {
+        return ElementsAre(Field(&LogLine::message, StartsWith(std::string(beginning))));
+    };
+    lose(1);
+    EXPECT_THAT(log.take(), told("1 analytics events were lost (1 since the start)"));
+    lose(2);
+    clock.advance(59);
+    lose(3);
+    EXPECT_THAT(log.take(), IsEmpty());
+    clock.advance(1);
+    lose(4);
+    EXPECT_THAT(log.take(), told("9 analytics events were lost (10 since the start)"));
+    lose(5);
+    EXPECT_THAT(log.take(), IsEmpty());
+    clock.advance(60);
+    maintain();
+    EXPECT_THAT(log.take(), told("5 analytics events were lost (15 since the start)"));
+    lose(6);
+    closeWriter();
+    EXPECT_THAT(log.take(), told("6 analytics events were lost (21 since the start)"));
+}
+
+// --- Readers
+
+TEST_F(EventWriterTest, AReaderSeesWhatIsCommittedWhileItGoesOn)
+{
+    keep({event(1)});
+    StoreReader reader(file());
+    for (std::int64_t count = 1; count < 50; ++count) {
+        ASSERT_EQ(reader.eventCount(), count);
+        keep({event(1)});
+    }
+}
+
+TEST_F(EventWriterTest, AReaderThatHoldsATransactionSeesOneStateAndHoldsUpNobody)
+{
+    keep({event(1)});
+    StoreReader reader(file());
+    reader.execute("BEGIN");
+    EXPECT_EQ(reader.eventCount(), 1);
+    keep(events(1000));
+    EXPECT_EQ(reader.eventCount(), 1);
+    reader.execute("COMMIT");
+    EXPECT_EQ(reader.eventCount(), 1001);
+}
+
+TEST_F(EventWriterTest, TheLogIsMovedToTheDatabaseBeforeItGrowsLarge)
+{
+    writer().open();
+    StoreReader reader(file()); // connected, and reading now and then
+    for (int round = 0; round < 100; ++round) {
+        keep(events(2000));
+        maintain();
+        ASSERT_LT(logBytes(), 2 * EventWriter::logBytesBetweenCheckpoints);
+        if (round % 10 == 0)
+            reader.eventCount();
+    }
+    EXPECT_GT(fs::file_size(file()), 50 * megabyte);
+}
+
+TEST_F(EventWriterTest, AMoreThanLongLogIsMovedEvenWhileThereIsMuchToKeep)
+{
+    writer().open();
+    std::uint64_t longest = 0;
+    for (int round = 0; round < 100; ++round) {
+        keep(events(2000));
+        longest = std::max(longest, logBytes());
+        maintain(false);
+    }
+    EXPECT_GT(longest, EventWriter::mostLogBytesBetweenCheckpoints);
+    EXPECT_LT(longest, EventWriter::mostLogBytesBetweenCheckpoints + 2 * megabyte);
+    EXPECT_GT(fs::file_size(file()), 20 * megabyte);
+}
+
+TEST_F(EventWriterTest, ALongLogIsMovedOnlyInAQuietMoment)
+{
+    writer().open();
+    EXPECT_FALSE(writer().awaitsQuiet());
+    for (int round = 0; round < 15; ++round)
+        keep(events(2000));
+    maintain(false);
+    EXPECT_LT(fs::file_size(file()), megabyte);
+    EXPECT_TRUE(writer().awaitsQuiet());
+    maintain(true);
+    EXPECT_GT(fs::file_size(file()), 8 * megabyte);
+    EXPECT_FALSE(writer().awaitsQuiet());
+}
+
+TEST_F(EventWriterTest, ALogThatAReaderHoldsIsNotWaitedForAgainAndAgain)
+{
+    writer().open();
+    StoreReader reader(file());
+    reader.execute("BEGIN");
+    EXPECT_EQ(reader.eventCount(), 0);
+    for (int round = 0; round < 15; ++round)
+        keep(events(2000));
+    EXPECT_TRUE(writer().awaitsQuiet());
+    maintain(true);
+    EXPECT_FALSE(writer().awaitsQuiet());
+}
+
+TEST_F(EventWriterTest, AReaderThatNeverEndsCostsEventsButNotTheDisk)
+{
+    configuration.maximumSizeMegabytes = 12;
+    keep(events(100));
+    StoreReader reader(file());
+    reader.execute("BEGIN");
+    EXPECT_EQ(reader.eventCount(), 100);
+    for (int round = 0; round < 60; ++round) {
+        keep(events(1000));
+        maintain();
+        ASSERT_LT(logBytes(), 14 * megabyte);
+    }
+    EXPECT_GT(lost(StoreError::LogHeld), 0U);
+    EXPECT_THAT(log.take(),
+                Each(Field(&LogLine::message,
+                           HasSubstr("a program has been reading the database for too "
+                                     "long; end it, or let it read in short "
+                                     "transactions"))));
+    EXPECT_EQ(reader.eventCount(), 100);
+
+    reader.execute("COMMIT");
+    const std::uint64_t before = lost(StoreError::LogHeld);
+    keep(events(1000));
+    EXPECT_EQ(lost(StoreError::LogHeld), before);
+}
+
+TEST_F(EventWriterTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginningAnew)
+{
+    configuration.maximumSizeMegabytes = 4;
+    keep(events(100));
+    // Before one ends its transaction, the other has begun one: there is never a moment without a reader.
+    std::jthread readers([this](const std::stop_token& stop) {
+        StoreReader first(file());
+        StoreReader second(file());
+        const auto begin = [](StoreReader& reader) {
+            reader.execute("BEGIN");
+            reader.number("SELECT max(id) FROM events");
+        };
+        begin(first);
+        while (!stop.stop_requested()) {
+            begin(second);
+            first.execute("COMMIT");
+            begin(first);
+            second.execute("COMMIT");
+        }
+    });
+    for (int round = 0; round < 60; ++round) {
+        keep(events(500));
+        maintain();
+        clock.advance(EventWriter::secondsBetweenWaits); // a wait in vain, on a busy machine, is not the last
+    }
+    EXPECT_EQ(lost(StoreError::LogHeld), 0U);
+    EXPECT_LT(logBytes(), 5 * megabyte);
+}
+
+TEST_F(EventWriterTest, AProgramThatWritesHoldsUpTheStoreButNotForEver)
+{
+    keep({event(1)});
+    sqlite3* other = nullptr;
+    ASSERT_EQ(::sqlite3_open(file().c_str(), &other), SQLITE_OK);
+    ASSERT_EQ(::sqlite3_exec(other, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr), SQLITE_OK);
+    keep({event(2)});
+    EXPECT_EQ(lost(StoreError::Locked), 1U);
+    EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("another program writes to the database"))));
+    ASSERT_EQ(::sqlite3_exec(other, "ROLLBACK", nullptr, nullptr, nullptr), SQLITE_OK);
+    ::sqlite3_close(other);
+    keep({event(3)});
+    EXPECT_EQ(StoreReader(file()).eventCount(), 2);
+}
+
+// --- Bounds
+
+TEST_F(EventWriterTest, WhatIsTooOldGoes)
+{
+    configuration.maximumAgeDays = 10;
+    clock.set(100 * 86400);
+    keep(events(3000, 10, 50 * 86400));
+    keep(events(20, 10, 90 * 86400 - 1));
+    keep(events(30, 10, 90 * 86400));
+    keep(events(5, 10, 100 * 86400));
+    maintain();
+    EXPECT_EQ(StoreReader(file()).number("SELECT min(time) / 86400 FROM events"), 90);
+    EXPECT_EQ(StoreReader(file()).eventCount(), 35);
+}
+
+TEST_F(EventWriterTest, AgeIsLookedAtRarely)
+{
+    configuration.maximumAgeDays = 10;
+    clock.set(100 * 86400);
+    keep({event(95 * 86400)});
+    maintain();
+    clock.set(200 * 86400);
+    keep({event(200 * 86400)});
+    maintain();
+    EXPECT_EQ(StoreReader(file()).eventCount(), 2);
+    clock.advance(EventWriter::secondsBetweenChecks);
+    maintain();
+    EXPECT_EQ(StoreReader(file()).eventCount(), 1);
+}
+
+TEST_F(EventWriterTest, AClockThatIsNotSetYetDeletesNothing)
+{
+    keep(events(100));
+    clock.set(0);
+    clock.advance(EventWriter::secondsBetweenChecks);
+    maintain();
+    EXPECT_EQ(StoreReader(file()).eventCount(), 100);
+}
+
+TEST_F(EventWriterTest, WhatIsTooMuchGoesOldestFirst)
+{
+    configuration.maximumSizeMegabytes = 2;
+    for (int round = 0; round < 30; ++round) {
+        keep(events(1000));
+        maintain();
+    }
+    closeWriter();
+    StoreReader reader(file());
+    EXPECT_LT(fs::file_size(file()), 2 * megabyte + 2 * EventWriter::bytesBetweenChecks);
+    EXPECT_EQ(reader.number("SELECT max(id) FROM events"), 30'000);
+    EXPECT_EQ(reader.number("SELECT max(id) - min(id) + 1 - count(*) FROM events"), 0); // no gap: the oldest went
+    EXPECT_GT(reader.eventCount(), 3000);
+    EXPECT_EQ(reader.text("PRAGMA integrity_check"), "ok");
+}
+
+TEST_F(EventWriterTest, FewButLargeEventsDoNotSlipThroughTheBound)
+{
+    configuration.maximumSizeMegabytes = 4;
+    keep(events(10'000, 50));
+    for (int round = 0; round < 60; ++round) {
+        keep(events(1, megabyte));
+        maintain();
+        ASSERT_LT(fs::file_size(file()), 8 * megabyte);
+    }
+    EXPECT_GE(StoreReader(file()).eventCount(), 3);
+}
+
+TEST_F(EventWriterTest, ALowerBoundMakesTheFileSmaller)
+{
+    keep(events(30'000));
+    maintain();
+    configuration.maximumSizeMegabytes = 1;
+    writer().setConfiguration(configuration);
+    maintain();
+    closeWriter();
+    EXPECT_LT(fs::file_size(file()), 2 * megabyte);
+    EXPECT_GT(StoreReader(file()).eventCount(), 1000);
+}
+
+TEST_F(EventWriterTest, HousekeepingIsDoneInSmallSteps)
+{
+    keep(events(30'000));
+    maintain();
+    configuration.maximumSizeMegabytes = 1;
+    writer().setConfiguration(configuration);
+    int steps = 1;
+    while (writer().maintain(true))
+        ++steps;
+    EXPECT_GT(steps, 15);
+}
+
+} // namespace
+} // namespace platform

@@ -1,0 +1,566 @@
+// The kernel event trace service: on a directory that looks like tracefs, for all that may go wrong with it; and on the
+// kernel itself, with real processes that emit, where this machine lets it.
+#include "platform/linux/trace/TracefsKernelTrace.h"
+#include "platform/linux/queues/SerialQueue.h"
+#include "platform/linux/trace/RealTracefs.h"
+#include "platform/linux/trace/TracePages.h"
+#include "support/fakes/FakeLog.h"
+
+#include <algorithm>
+#include <atomic>
+#include <condition_variable>
+#include <deque>
+#include <gmock/gmock.h>
+#include <map>
+#include <mutex>
+#include <sys/mman.h>
+#include <sys/wait.h>
+
+namespace platform {
+namespace {
+
+namespace fs = std::filesystem;
+using support::IsLine;
+using support::TracePageBuilder;
+using testing::Each;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+constexpr std::uint32_t firstCode = 0x21040000;
+constexpr std::uint32_t lastCode = 0x2104408A;
+constexpr std::chrono::seconds patience{20};
+
+std::uint64_t now()
+{
+    return static_cast<std::uint64_t>(std::chrono::steady_clock::now().time_since_epoch().count());
+}
+
+// In microseconds.
+std::int64_t timeOfDay()
+{
+    return std::chrono::floor<std::chrono::microseconds>(std::chrono::system_clock::now()).time_since_epoch().count();
+}
+std::int64_t timeOfDay(const KernelTraceEvent& event)
+{
+    return event.wallTime.seconds * 1'000'000 + event.wallTime.microseconds;
+}
+constexpr std::int64_t clockTolerance = 500'000; // the two clocks are not looked at in one moment
+
+// A session and what was delivered to it.
+class Listener {
+public:
+    explicit Listener(TracefsKernelTrace& trace, bool hasWallTimes = true) : session(trace.createTraceSession())
+    {
+        if (!session)
+            throw std::runtime_error("there is no trace");
+        session->enableWallTimes(hasWallTimes);
+        session->setCompletionHandler([this] {
+            const std::scoped_lock lock(mutex_);
+            ++completions_;
+            isOnQueue_ &= queue->isCurrent();
+            changed_.notify_all();
+        });
+        EXPECT_EQ(session->filterEventRange(firstCode, lastCode,
+                                            [this](const KernelTraceEvent& event) {
+                                                const std::scoped_lock lock(mutex_);
+                                                isOnQueue_ &= queue->isCurrent() && completions_ == 0;
+                                                events_.push_back(event);
+                                                changed_.notify_all();
+                                            }),
+                  0);
+    }
+
+    int start()
+    {
+        beforeStart = now();
+        const int error = session->start(queue);
+        afterStart = now();
+        return error;
+    }
+    void end()
+    {
+        beforeEnd = now();
+        session->end();
+        afterEnd = now();
+    }
+    // Whether it was completed, and once.
+    [[nodiscard]] bool waitForCompletion()
+    {
+        std::unique_lock lock(mutex_);
+        return changed_.wait_for(lock, patience, [&] { return completions_ > 0; }) && completions_ == 1;
+    }
+    [[nodiscard]] bool waitForEvents(std::size_t count)
+    {
+        std::unique_lock lock(mutex_);
+        return changed_.wait_for(lock, patience, [&] { return events_.size() >= count; });
+    }
+    [[nodiscard]] std::vector<KernelTraceEvent> events()
+    {
+        const std::scoped_lock lock(mutex_);
+        EXPECT_TRUE(isOnQueue_) << "all handlers run on the queue, events before the end";
+        return events_;
+    }
+    [[nodiscard]] std::vector<std::uint32_t> codes()
+    {
+        std::vector<std::uint32_t> codes;
+        for (const KernelTraceEvent& event : events())
+            codes.push_back(event.eventCode);
+        return codes;
+    }
+
+    std::uint64_t beforeStart = 0;
+    std::uint64_t afterStart = 0;
+    std::uint64_t beforeEnd = 0;
+    std::uint64_t afterEnd = 0;
+
+private:
+    std::mutex mutex_;
+    std::condition_variable changed_;
+    std::vector<KernelTraceEvent> events_;
+    int completions_ = 0;
+    bool isOnQueue_ = true;
+
+public: // these go first
+    const std::shared_ptr<SerialQueue> queue =
+        std::make_shared<SerialQueue>("trace", QualityOfService::Default, nullptr);
+    std::unique_ptr<KernelTraceSession> session;
+};
+
+class TracefsKernelTraceTest : public testing::Test {
+protected:
+    [[nodiscard]] std::string markers() const { return tree.content("trace_marker_raw"); }
+    // Until the thread has switched the instance off.
+    [[nodiscard]] bool waitUntilOff() const
+    {
+        const auto end = std::chrono::steady_clock::now() + patience;
+        while (tree.content("buffer_size_kb") != "4" && std::chrono::steady_clock::now() < end)
+            std::this_thread::yield();
+        return tree.content("tracing_on") == "0" && tree.content("buffer_size_kb") == "4";
+    }
+
+    support::TracefsTree tree;
+    support::FakeLog log;
+    TracefsMarkers ownMarkers;
+    TraceMarkerAccess access;
+    TracefsKernelTrace trace{{.mounts = tree.mounts, .instanceName = "kesto"}, ownMarkers, access, ProviderLog(log)};
+};
+
+TEST_F(TracefsKernelTraceTest, TouchesNothingBeforeThereIsASession)
+{
+    EXPECT_EQ(tree.content("tracing_on"), "before");
+    ownMarkers.emit(1, {});
+    EXPECT_EQ(markers(), "before");
+}
+
+TEST_F(TracefsKernelTraceTest, IsOnWhileASessionRunsAndOffOtherwise)
+{
+    Listener listener(trace);
+    EXPECT_EQ(tree.content("tracing_on"), "0");
+    ASSERT_EQ(listener.start(), 0);
+    EXPECT_EQ(tree.content("tracing_on"), "1");
+    listener.end();
+    EXPECT_TRUE(listener.waitForCompletion());
+    EXPECT_TRUE(waitUntilOff());
+    Listener again(trace);
+    ASSERT_EQ(again.start(), 0);
+    EXPECT_EQ(tree.content("tracing_on"), "1");
+    EXPECT_EQ(tree.content("buffer_size_kb"), "8192");
+    again.session.reset();
+    EXPECT_TRUE(waitUntilOff()) << "a session that goes without an end is over, too";
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
+{
+    Listener listener(trace);
+    ASSERT_EQ(listener.start(), 0);
+    const std::int64_t day = timeOfDay();
+    const std::uint64_t time = now();
+    tree.put(0,
+             TracePageBuilder(1000)
+                 .event(2000, firstCode) // before the start
+                 .event(time, firstCode + 1, 77, {1, 2, 3, 4})
+                 .event(time + 50, lastCode + 1)
+                 .event(time + 100, lastCode)
+                 .page());
+    tree.put(1, TracePageBuilder(time).event(time + 50, firstCode + 2).page());
+    ASSERT_TRUE(listener.waitForEvents(3));
+    tree.put(0, TracePageBuilder(time).event(now() + 3'000'000'000, firstCode + 3).page()); // after the end
+    listener.end();
+    EXPECT_TRUE(listener.waitForCompletion());
+    EXPECT_THAT(listener.codes(), ElementsAre(firstCode + 1, firstCode + 2, lastCode));
+    const KernelTraceEvent first = listener.events()[0];
+    EXPECT_EQ(first.threadID, 77U);
+    EXPECT_EQ(listener.session->timestampToNanoseconds(first.timestamp), time);
+    EXPECT_NEAR(timeOfDay(first), day, clockTolerance);
+}
+
+TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
+{
+    Listener listener(trace);
+    ASSERT_EQ(listener.start(), 0);
+    tree.put(0, TracePageBuilder(1000).event(now(), firstCode).missed(1840).page());
+    ASSERT_TRUE(listener.waitForEvents(1));
+    listener.end();
+    ASSERT_TRUE(listener.waitForCompletion());
+    EXPECT_EQ(listener.session->lostEvents(), 1840U);
+
+    Listener next(trace);
+    ASSERT_EQ(next.start(), 0);
+    next.end();
+    ASSERT_TRUE(next.waitForCompletion());
+    EXPECT_EQ(next.session->lostEvents(), 0U) << "what others lost before";
+}
+
+TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherSomebodyTraces)
+{
+    std::optional<TraceDescriptors> handedOut;
+    access.ask(this, [&](const TraceDescriptors& descriptors) { handedOut = descriptors; });
+    Listener one(trace);
+    ASSERT_TRUE(handedOut) << "when the first session is made";
+    const auto flag = [&] {
+        std::uint32_t value = 7;
+        EXPECT_EQ(::pread(handedOut->page, &value, sizeof value, 0), 4);
+        return value;
+    };
+    Listener two(trace);
+    EXPECT_EQ(flag(), 0U);
+    ASSERT_EQ(one.start(), 0);
+    ASSERT_EQ(two.start(), 0);
+    EXPECT_EQ(flag(), 1U);
+    ownMarkers.emit(0x2104482C, {});
+    EXPECT_EQ(markers().substr(0, 8), std::string("KSTO\x2C\x48\x04\x21"));
+    one.end();
+    EXPECT_EQ(flag(), 1U);
+    two.end();
+    EXPECT_EQ(flag(), 0U) << "at once, although it is not complete";
+    fs::resize_file(tree.instance / "trace_marker_raw", 0);
+    ownMarkers.emit(0x2104482C, {});
+    EXPECT_EQ(markers(), "");
+    EXPECT_TRUE(one.waitForCompletion());
+    EXPECT_TRUE(two.waitForCompletion());
+}
+
+TEST_F(TracefsKernelTraceTest, CompletesASessionThatCouldNotBeStarted)
+{
+    Listener listener(trace);
+    fs::remove(tree.instance / "tracing_on");
+    EXPECT_EQ(listener.start(), ENOENT);
+    EXPECT_THAT(log.lines(),
+                ElementsAre(IsLine(LogLevel::Error, "kerl",
+                                   "the kernel trace cannot be switched on: No such file or directory")));
+    listener.end();
+    EXPECT_TRUE(listener.waitForCompletion());
+}
+
+TEST_F(TracefsKernelTraceTest, RunsNoMoreSessionsThanItMay)
+{
+    std::deque<Listener> listeners;
+    for (std::size_t count = 0; count < TraceFanOut::mostSessions; ++count)
+        ASSERT_EQ(listeners.emplace_back(trace).start(), 0);
+    Listener extra(trace);
+    EXPECT_EQ(extra.start(), EMFILE);
+    extra.end();
+    EXPECT_TRUE(extra.waitForCompletion());
+}
+
+TEST_F(TracefsKernelTraceTest, CountsAsOffWithoutTracefsAndSaysSoOnce)
+{
+    const std::string mounted = support::readFile(tree.mounts);
+    support::writeFile(tree.mounts, "");
+    EXPECT_FALSE(trace.isAvailable());
+    EXPECT_EQ(trace.createTraceSession(), nullptr);
+    EXPECT_EQ(trace.createTraceSession(), nullptr);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(LogLevel::Error, "kerl", "there is no kernel trace: tracefs is not mounted")));
+    support::writeFile(tree.mounts, mounted);
+    fs::rename(tree.instance / "tracing_on", tree.instance / "kept");
+    EXPECT_EQ(trace.createTraceSession(), nullptr);
+    EXPECT_EQ(trace.createTraceSession(), nullptr);
+    EXPECT_THAT(log.take(), SizeIs(1)) << "another reason";
+    fs::rename(tree.instance / "kept", tree.instance / "tracing_on");
+    EXPECT_TRUE(trace.isAvailable()) << "what was missing came";
+    EXPECT_NE(trace.createTraceSession(), nullptr);
+    EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(TracefsKernelTraceTest, SaysWhatIsForbidden)
+{
+    constexpr uid_t nobody = 65534;
+    const bool isRoot = ::geteuid() == 0;
+    for (const fs::path& path : {tree.directory.path(), tree.directory.path() / "tracing", tree.mounts})
+        fs::permissions(path, fs::perms(0055), fs::perm_options::add);
+    fs::permissions(tree.instance.parent_path(), fs::perms::none);
+    ASSERT_TRUE(!isRoot || ::seteuid(nobody) == 0); // nothing is forbidden to root
+    const auto session = trace.createTraceSession();
+    ASSERT_TRUE(!isRoot || ::seteuid(0) == 0);
+    fs::permissions(tree.instance.parent_path(), fs::perms::owner_all);
+    EXPECT_EQ(session, nullptr);
+    EXPECT_THAT(log.take().at(0).message, HasSubstr("Permission denied"));
+}
+
+// ---- On the kernel
+
+// One process that emits, and when it did: before and after each event.
+struct Emitter {
+    static constexpr std::size_t most = 100'000;
+    static constexpr std::size_t lead = 200; // how far it may run ahead of who reads, which may be much slower
+    struct Moment {
+        std::uint64_t before;
+        std::uint64_t after;
+    };
+    std::atomic<std::size_t> count;
+    std::atomic<std::size_t> allowed;
+    std::array<Moment, most> moments;
+};
+
+class RealTraceTest : public testing::Test {
+protected:
+    void SetUp() override
+    {
+        if (tracefs.problem())
+            GTEST_SKIP() << *tracefs.problem();
+        trace.emplace(TracefsPlace{.mounts = tracefs.mounts(), .instanceName = tracefs.instanceName}, ownMarkers,
+                      access, ProviderLog(log));
+        access.ask(this, [this](const TraceDescriptors& descriptors) { marker = descriptors.marker; });
+    }
+
+    void write(const TraceMarkerRecord& record) const { EXPECT_EQ(::write(marker, &record, sizeof record), 40); }
+
+    support::RealTracefs tracefs;
+    support::FakeLog log;
+    TracefsMarkers ownMarkers;
+    TraceMarkerAccess access;
+    std::optional<TracefsKernelTrace> trace;
+    int marker = -1;
+};
+
+TEST_F(RealTraceTest, DeliversTheEventsOfThisProcessWithTheirTimes)
+{
+    Listener listener(*trace);
+    const TraceMarkerRecord early{.code = firstCode};
+    EXPECT_LT(::write(marker, &early, sizeof early), 0) << "the kernel takes nothing while nobody traces";
+    ASSERT_EQ(listener.start(), 0);
+    const std::int64_t day = timeOfDay();
+    const std::uint64_t before = now();
+    ownMarkers.emit(firstCode + 1, {1, 2, 3, UINT64_MAX});
+    const std::uint64_t between = now();
+    ownMarkers.emit(firstCode + 2, {});
+    const std::uint64_t after = now();
+    ownMarkers.emit(lastCode + 1, {});
+    listener.end();
+    ASSERT_TRUE(listener.waitForCompletion());
+    ASSERT_THAT(listener.codes(), ElementsAre(firstCode + 1, firstCode + 2));
+    const auto events = listener.events();
+    EXPECT_THAT(events[0].arguments, ElementsAre(1U, 2U, 3U, UINT64_MAX));
+    EXPECT_EQ(events[0].threadID, static_cast<std::uint64_t>(::gettid()));
+    EXPECT_GE(events[0].timestamp, before);
+    EXPECT_LE(events[0].timestamp, between);
+    EXPECT_NEAR(timeOfDay(events[0]), day, clockTolerance);
+    EXPECT_GE(events[1].timestamp, between);
+    EXPECT_LE(events[1].timestamp, after);
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+// A test of everything at once: sessions come and go while processes emit, and each gets exactly what is its own.
+TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
+{
+    constexpr std::size_t processes = 3;
+    constexpr std::size_t sessions = 40;
+    constexpr std::size_t step = 300; // events between two starts
+    constexpr std::size_t length = 3000; // events from a session's start to its end
+    std::deque<Listener> listeners;
+    for (std::size_t index = 0; index < sessions; ++index)
+        listeners.emplace_back(*trace);
+
+    void* const shared =
+        ::mmap(nullptr, sizeof(Emitter) * processes, PROT_READ | PROT_WRITE, MAP_SHARED | MAP_ANONYMOUS, -1, 0);
+    ASSERT_NE(shared, MAP_FAILED);
+    auto* const emitters = static_cast<Emitter*>(shared);
+    std::vector<pid_t> children;
+    for (std::size_t index = 0; index < processes; ++index) {
+        const pid_t child = ::fork();
+        ASSERT_GE(child, 0);
+        if (child == 0) {
+            Emitter& emitter = emitters[index];
+            for (std::size_t number = 0; number < Emitter::most; ++number) {
+                while (number >= emitter.allowed)
+                    ::sched_yield();
+                const TraceMarkerRecord record{.code = firstCode + static_cast<std::uint32_t>(index),
+                                               .arguments = {number}};
+                emitter.moments[number].before = now();
+                (void)!::write(marker, &record, sizeof record);
+                emitter.moments[number].after = now();
+                emitter.count.store(number + 1, std::memory_order_release);
+                ::sched_yield();
+            }
+            ::_exit(0);
+        }
+        children.push_back(child);
+    }
+    const auto total = [&] {
+        std::size_t count = 0;
+        for (std::size_t index = 0; index < processes; ++index)
+            count += emitters[index].count.load(std::memory_order_acquire);
+        return count;
+    };
+    const auto letThemGoOn = [&] {
+        for (std::size_t index = 0; index < processes; ++index)
+            emitters[index].allowed = emitters[index].count + Emitter::lead;
+    };
+    const auto giveUp = std::chrono::steady_clock::now() + patience;
+    std::size_t started = 0;
+    std::size_t ended = 0;
+    std::vector<std::size_t> startedAt(sessions);
+    for (std::size_t first = total(); ended < sessions && std::chrono::steady_clock::now() < giveUp;) {
+        letThemGoOn();
+        const std::size_t count = total();
+        if (started < sessions && count >= first + started * step) {
+            startedAt[started] = count;
+            EXPECT_EQ(listeners[started++].start(), 0);
+        } else if (ended < started && count >= startedAt[ended] + length) {
+            listeners[ended++].end();
+        } else {
+            ::sched_yield();
+        }
+    }
+    for (const pid_t child : children)
+        ::kill(child, SIGKILL);
+    for (const pid_t child : children)
+        ::waitpid(child, nullptr, 0);
+    ASSERT_EQ(ended, sessions);
+
+    for (Listener& listener : listeners) {
+        ASSERT_TRUE(listener.waitForCompletion());
+        const auto events = listener.events();
+        EXPECT_TRUE(std::ranges::is_sorted(events, {}, &KernelTraceEvent::timestamp));
+        std::array<std::vector<std::uint64_t>, processes> delivered;
+        for (const KernelTraceEvent& event : events) {
+            ASSERT_LT(event.eventCode - firstCode, processes);
+            ASSERT_EQ(event.threadID, static_cast<std::uint64_t>(children[event.eventCode - firstCode]));
+            delivered[event.eventCode - firstCode].push_back(event.arguments[0]);
+        }
+        for (std::size_t index = 0; index < processes; ++index) {
+            const Emitter& emitter = emitters[index];
+            const std::size_t count = emitter.count;
+            const auto begin = emitter.moments.begin();
+            const auto end = begin + static_cast<std::ptrdiff_t>(count);
+            const auto& numbers = delivered[index];
+            // What was surely within, and what may have been.
+            const auto sure = std::ranges::lower_bound(begin, end, listener.afterStart, {}, &Emitter::Moment::before);
+            const auto sureEnd = std::ranges::upper_bound(sure, end, listener.beforeEnd, {}, &Emitter::Moment::after);
+            for (std::size_t place = 1; place < numbers.size(); ++place)
+                ASSERT_EQ(numbers[place], numbers[place - 1] + 1) << "missing or doubled";
+            if (sure != sureEnd) {
+                ASSERT_FALSE(numbers.empty());
+                EXPECT_LE(numbers.front(), static_cast<std::uint64_t>(sure - begin));
+                EXPECT_GE(numbers.back(), static_cast<std::uint64_t>(sureEnd - begin) - 1);
+            }
+            if (!numbers.empty()) {
+                EXPECT_GE(emitter.moments[numbers.front()].after, listener.beforeStart) << "from before the start";
+                EXPECT_LE(emitter.moments[numbers.back()].before, listener.afterEnd) << "from after the end";
+            }
+        }
+    }
+    EXPECT_THAT(log.lines(), IsEmpty()) << "nothing is lost";
+    ::munmap(shared, sizeof(Emitter) * processes);
+}
+
+TEST_F(RealTraceTest, LeavesOutWhatOthersWriteToTheMarker)
+{
+    Listener listener(*trace);
+    ASSERT_EQ(listener.start(), 0);
+    const std::string noise(3000, 'K');
+    for (const std::size_t size : {4U, 39U, 41U, 40U, 3000U})
+        EXPECT_EQ(::write(marker, noise.data(), size), static_cast<ssize_t>(size));
+    TraceMarkerRecord record{.code = firstCode};
+    EXPECT_LT(::write(marker, &record, 3), 0) << "the kernel wants a tag";
+    EXPECT_EQ(::write(marker, &record, 36), 36);
+    write(record);
+    listener.end();
+    ASSERT_TRUE(listener.waitForCompletion());
+    EXPECT_THAT(listener.codes(), ElementsAre(firstCode));
+    EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(RealTraceTest, CountsWhatTheKernelLost)
+{
+    auto instance = TracefsInstance::open(tracefs.path(), tracefs.instanceName);
+    ASSERT_TRUE(instance) << instance.error().what;
+    ASSERT_FALSE(instance->switchOn());
+    constexpr std::size_t emitted = 500'000;
+    const TraceMarkerRecord record{.code = firstCode};
+    for (std::size_t count = 0; count < emitted; ++count)
+        ASSERT_EQ(::write(instance->marker(), &record, sizeof record), 40);
+    TraceMerger merger(instance->pageFormat(), instance->markerType());
+    instance->readPages([&](std::uint32_t cpu, std::span<const std::byte> page) { merger.take(cpu, page); });
+    const std::size_t delivered = merger.eventsUpTo(UINT64_MAX).size();
+    const std::uint64_t lost = merger.takeLosses();
+    EXPECT_GE(delivered, 100'000U) << "so many a buffer holds";
+    EXPECT_GT(lost, 0U);
+    EXPECT_EQ(delivered + lost, emitted);
+    instance->switchOff();
+}
+
+TEST_F(RealTraceTest, TakesOverWhatAKilledServiceLeftBehind)
+{
+    std::array<int, 2> ready{};
+    ASSERT_EQ(::pipe(ready.data()), 0);
+    const pid_t child = ::fork();
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+        auto instance = TracefsInstance::open(tracefs.path(), tracefs.instanceName);
+        const bool isOn = instance && !instance->switchOn();
+        const TraceMarkerRecord record{.code = firstCode};
+        if (isOn)
+            (void)!::write(instance->marker(), &record, sizeof record);
+        (void)!::write(ready[1], isOn ? "1" : "0", 1);
+        ::pause();
+        ::_exit(0);
+    }
+    char isOn = 0;
+    ASSERT_EQ(::read(ready[0], &isOn, 1), 1);
+    ::close(ready[0]);
+    ::close(ready[1]);
+    EXPECT_EQ(isOn, '1');
+    {
+        const auto taken = TracefsInstance::open(tracefs.path(), tracefs.instanceName);
+        ASSERT_FALSE(taken);
+        EXPECT_TRUE(taken.error().isInUse);
+    }
+    ::kill(child, SIGKILL);
+    ::waitpid(child, nullptr, 0);
+    Listener listener(*trace);
+    ASSERT_EQ(listener.start(), 0);
+    ownMarkers.emit(firstCode + 1, {});
+    listener.end();
+    ASSERT_TRUE(listener.waitForCompletion());
+    EXPECT_THAT(listener.codes(), ElementsAre(firstCode + 1));
+    EXPECT_FALSE(fs::exists(tracefs.path() / "instances" / (tracefs.instanceName + "-2")));
+}
+
+TEST_F(RealTraceTest, HasAnInstanceForEachServiceOnTheMachine)
+{
+    TracefsMarkers otherMarkers;
+    TraceMarkerAccess otherAccess;
+    TracefsKernelTrace other({.mounts = tracefs.mounts(), .instanceName = tracefs.instanceName}, otherMarkers,
+                             otherAccess, ProviderLog(log));
+    Listener one(*trace);
+    Listener two(other);
+    ASSERT_EQ(one.start(), 0);
+    ASSERT_EQ(two.start(), 0);
+    ownMarkers.emit(firstCode + 1, {});
+    otherMarkers.emit(firstCode + 2, {});
+    one.end();
+    two.end();
+    ASSERT_TRUE(one.waitForCompletion());
+    ASSERT_TRUE(two.waitForCompletion());
+    EXPECT_THAT(one.codes(), ElementsAre(firstCode + 1));
+    EXPECT_THAT(two.codes(), ElementsAre(firstCode + 2));
+    two.session.reset();
+}
+
+} // namespace
+} // namespace platform

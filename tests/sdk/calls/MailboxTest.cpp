@@ -1,0 +1,102 @@
+// Who rings when: the promise that sending makes no system call while a session is started.
+#include "calls/Mailbox.h"
+
+#include <gtest/gtest.h>
+#include <poll.h>
+#include <sys/eventfd.h>
+
+namespace {
+
+using libkesto::CallHead;
+using libkesto::Mailbox;
+
+class MailboxTest : public testing::Test {
+protected:
+    bool send() { return mailbox_.putMessage(message_, {}, "entries"); }
+    bool call(kesto_operation operation) { return mailbox_.putCall({.operation = operation}); }
+
+    // Whether somebody rang since this was asked last.
+    bool hasRung()
+    {
+        pollfd doorbell{mailbox_.doorbell(), POLLIN, 0};
+        ::poll(&doorbell, 1, 0);
+        eventfd_t rings = 0;
+        return doorbell.revents != 0 && eventfd_read(mailbox_.doorbell(), &rings) == 0;
+    }
+
+    void takeAll()
+    {
+        while (mailbox_.front())
+            mailbox_.popFront();
+    }
+
+    const CallHead message_{.operation = KESTO_OPERATION_SEND};
+    Mailbox mailbox_{4096, platform::FileDescriptor(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK))};
+};
+
+TEST_F(MailboxTest, MessagesDoNotRingWhileTheThreadIsAwake)
+{
+    EXPECT_TRUE(send());
+    EXPECT_FALSE(hasRung());
+}
+
+TEST_F(MailboxTest, TheFirstMessageWakesAThreadThatSleepsAndOthersDoNotRingAgain)
+{
+    ASSERT_TRUE(mailbox_.fallAsleep());
+    EXPECT_TRUE(send());
+    EXPECT_TRUE(hasRung());
+    EXPECT_TRUE(send());
+    EXPECT_FALSE(hasRung());
+}
+
+TEST_F(MailboxTest, TheThreadDoesNotFallAsleepOverWhatWasPut)
+{
+    EXPECT_TRUE(send());
+    EXPECT_FALSE(mailbox_.fallAsleep());
+    EXPECT_TRUE(send());
+    EXPECT_FALSE(hasRung()) << "it is awake again";
+}
+
+TEST_F(MailboxTest, CallsRingInAnyCase)
+{
+    EXPECT_TRUE(call(KESTO_OPERATION_CREATE_SESSION));
+    EXPECT_TRUE(hasRung());
+    EXPECT_TRUE(call(KESTO_OPERATION_CREATE_SESSION));
+    EXPECT_TRUE(hasRung());
+}
+
+TEST_F(MailboxTest, MessagesBehindAStartDoNotRingThoughTheThreadStillSleeps)
+{
+    ASSERT_TRUE(mailbox_.fallAsleep());
+    EXPECT_TRUE(call(KESTO_OPERATION_START_SESSION));
+    EXPECT_TRUE(hasRung()) << "the start itself does";
+    EXPECT_TRUE(send());
+    EXPECT_FALSE(hasRung());
+
+    mailbox_.wakeUp(false);
+    takeAll();
+    ASSERT_TRUE(mailbox_.fallAsleep());
+    EXPECT_TRUE(send());
+    EXPECT_TRUE(hasRung()) << "once the start is taken, a thread that sleeps all the same is woken";
+}
+
+TEST_F(MailboxTest, AStartThatFindsNoRoomRingsForThoseWhoCountedOnIt)
+{
+    while (call(KESTO_OPERATION_STOP_SESSION)) { }
+    hasRung();
+    EXPECT_FALSE(call(KESTO_OPERATION_START_SESSION));
+    EXPECT_TRUE(hasRung());
+    takeAll();
+    ASSERT_TRUE(mailbox_.fallAsleep());
+    EXPECT_TRUE(send());
+    EXPECT_TRUE(hasRung()) << "it is not counted as under way";
+}
+
+TEST_F(MailboxTest, CallsFindRoomWhenMessagesDoNotAnyMore)
+{
+    while (send()) { }
+    EXPECT_TRUE(call(KESTO_OPERATION_STOP_SESSION));
+    EXPECT_FALSE(send());
+}
+
+} // namespace

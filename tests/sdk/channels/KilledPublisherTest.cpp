@@ -1,0 +1,249 @@
+// What a publisher leaves when its process is killed: what the service makes of it, and what the next publisher does.
+#include "kesto/channels.hpp"
+#include "platform/linux/channels/ChannelTree.h"
+#include "support/TemporaryDirectory.h"
+#include "support/Victim.h"
+
+#include <algorithm>
+#include <array>
+#include <cerrno>
+#include <filesystem>
+#include <gmock/gmock.h>
+#include <sched.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+namespace {
+
+namespace fs = std::filesystem;
+using kesto::Status;
+using support::Victim;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::UnorderedElementsAre;
+
+class KilledPublisherTest : public testing::Test {
+protected:
+    KilledPublisherTest() { fs::create_directory(root); }
+
+    // Publishes channels, which are groups, subgroups and names of the driver "amp"; never ends by itself.
+    [[nodiscard]] bool publish(const std::vector<std::array<std::string, 3>>& names) const
+    {
+        static kesto::Publisher publisher; // of the process that runs this
+        static std::vector<kesto::SimpleChannel> channels;
+        kesto::PublisherOptions options;
+        options.root = root;
+        bool isRight = publisher.isOpen() || publisher.open(options) == Status::Ok;
+        for (const auto& [group, subgroup, name] : names)
+            isRight =
+                channels.emplace_back().create(publisher, {"amp", group, subgroup, name}) == Status::Ok && isRight;
+        return isRight;
+    }
+    [[nodiscard]] Victim publisher(const std::vector<std::array<std::string, 3>>& names) const
+    {
+        return Victim([this, names] { return publish(names); });
+    }
+    // Of the channels as the service sees them.
+    [[nodiscard]] std::vector<std::string> channels() const
+    {
+        const auto reading = platform::ChannelTree(root).read({}).value();
+        EXPECT_THAT(reading.problems, IsEmpty());
+        std::vector<std::string> names;
+        for (const auto& channel : reading.channels)
+            names.push_back(*channel.name);
+        return names;
+    }
+    // Every file below the root, hidden ones too.
+    [[nodiscard]] std::vector<std::string> files() const
+    {
+        std::vector<std::string> names;
+        for (const auto& entry : fs::recursive_directory_iterator(root))
+            if (entry.symlink_status().type() != fs::file_type::directory)
+                names.push_back(entry.path().lexically_relative(root));
+        std::ranges::sort(names);
+        return names;
+    }
+    [[nodiscard]] static std::string ownerOf(const fs::path& file)
+    {
+        const std::string text = support::readFile(file);
+        return text.substr(text.find(' ') + 1, 16);
+    }
+
+    const support::TemporaryDirectory directory;
+    const fs::path root = directory.path() / "channels";
+};
+
+TEST_F(KilledPublisherTest, ItsChannelsAreNotThereAnyMore)
+{
+    Victim first = publisher({{"Tx", "", "late cycles"}, {"Speaker", "dock", "state"}});
+    const Victim second = publisher({{"Tx", "", "cycles"}});
+    EXPECT_THAT(channels(), UnorderedElementsAre("late cycles", "state", "cycles"));
+    first.kill();
+    EXPECT_THAT(channels(), ElementsAre("cycles"));
+}
+
+TEST_F(KilledPublisherTest, FilesOfThoseWhoKnowNothingOfItStayWhatTheyWere)
+{
+    Victim killed = publisher({{"Tx", "", "a"}, {"Tx", "", "b"}});
+    support::writeFile(root / "amp/Tx/-/by hand", "simple\n1\n");
+    killed.kill();
+    EXPECT_THAT(channels(), ElementsAre("by hand"));
+    support::replaceFile(root / "amp/Tx/-/b", "simple\n2\n");
+    EXPECT_THAT(channels(), ElementsAre("b", "by hand"));
+    const Victim next = publisher({{"Rx", "", "c"}});
+    EXPECT_THAT(channels(), UnorderedElementsAre("b", "by hand", "c"));
+}
+
+TEST_F(KilledPublisherTest, TheNextPublisherOfTheDriverClearsAwayWhatItLeft)
+{
+    Victim killed = publisher({{"Tx", "", "a"}, {"Speaker", "dock", "state"}, {"", "MCA", "b"}});
+    const std::string owner = ownerOf(root / "amp/Tx/-/a");
+    killed.kill();
+    support::writeFile(root / "amp/Speaker/dock" / (".kesto-" + owner + ".tmp"), "sim");
+    support::writeFile(root / "amp/Speaker/dock/.kesto-0123456789abcdef.tmp", "of one that is long gone");
+    support::writeFile(root / "amp/.kesto-0123456789abcdef.owner", "");
+    const Victim next = publisher({{"Rx", "", "c"}});
+    EXPECT_THAT(files(), ElementsAre("amp/.kesto-" + ownerOf(root / "amp/Rx/-/c") + ".owner", "amp/Rx/-/c"));
+    EXPECT_FALSE(fs::exists(root / "amp/Speaker")) << "nor are its folders left";
+}
+
+TEST_F(KilledPublisherTest, TheNextPublisherLeavesAloneWhatIsNotItsToClear)
+{
+    const Victim living = publisher({{"Tx", "", "a"}});
+    Victim killed = publisher({{"Tx", "", "b"}});
+    const std::string owner = ownerOf(root / "amp/Tx/-/a");
+    killed.kill();
+    const std::vector<std::string> others{"amp/Tx/-/.kesto-" + owner + ".tmp",
+                                          "amp/Tx/-/.kesto-1.tmp",
+                                          "amp/Tx/-/.new",
+                                          "amp/Tx/-/by hand",
+                                          "amp/README",
+                                          "amp/.kesto-x.owner"};
+    for (const std::string& other : others)
+        support::writeFile(root / other, "simple\n1\n");
+    fs::create_directories(directory.path() / "elsewhere/-");
+    fs::copy(root / "amp/Tx/-/b", directory.path() / "elsewhere/-/b");
+    fs::create_directory_symlink(directory.path() / "elsewhere", root / "amp/Rx");
+    fs::create_symlink(root / "amp/Tx/-/b", root / "amp/Tx/-/link");
+    fs::create_directories(root / "amp/Tx/-/folder/deeper");
+    const Victim next = publisher({{"Tx", "", "c"}});
+    std::vector<std::string> expected = others;
+    for (const char* name : {"amp/Tx/-/a", "amp/Tx/-/c", "amp/Tx/-/link", "amp/Rx"})
+        expected.emplace_back(name);
+    for (const std::string& each : {owner, ownerOf(root / "amp/Tx/-/c")})
+        expected.push_back("amp/.kesto-" + each + ".owner");
+    EXPECT_THAT(files(), testing::UnorderedElementsAreArray(expected));
+    EXPECT_TRUE(fs::exists(directory.path() / "elsewhere/-/b"));
+    EXPECT_TRUE(fs::exists(root / "amp/Tx/-/folder/deeper"));
+}
+
+TEST_F(KilledPublisherTest, FilesOfOtherUsersAreNotCleared)
+{
+    constexpr uid_t nobody = 65534;
+    Victim killed = publisher({{"Tx", "", "a"}, {"Tx", "", "b"}});
+    killed.kill();
+    if (::geteuid() != 0 || ::chown((root / "amp/Tx/-/a").c_str(), nobody, nobody) != 0)
+        GTEST_SKIP() << "only root can give files away";
+    const Victim next = publisher({{"Tx", "", "c"}});
+    EXPECT_TRUE(fs::exists(root / "amp/Tx/-/a"));
+    EXPECT_FALSE(fs::exists(root / "amp/Tx/-/b"));
+    EXPECT_THAT(channels(), ElementsAre("c"));
+}
+
+TEST_F(KilledPublisherTest, LivesInAnotherNamespaceOfProcessesToo)
+{
+    if (::geteuid() != 0)
+        GTEST_SKIP() << "only root makes one at will";
+    const pid_t outer = ::fork();
+    if (outer == 0) { // whose children are in the new one
+        if (::unshare(CLONE_NEWPID) != 0)
+            ::_exit(errno == EPERM ? 2 : 1);
+        Victim contained([this] { return ::getpid() == 1 && publish({{"Tx", "", "a"}}); });
+        const bool wasThere = channels() == std::vector<std::string>{"a"};
+        contained.kill();
+        ::_exit(wasThere && channels().empty() ? 0 : 1);
+    }
+    int status = 0;
+    ASSERT_EQ(::waitpid(outer, &status, 0), outer);
+    if (WEXITSTATUS(status) == 2)
+        GTEST_SKIP() << "there can be no other here";
+    EXPECT_EQ(status, 0);
+}
+
+// --- the publisher that lives
+
+TEST_F(KilledPublisherTest, APublisherThatEndsLeavesNothing)
+{
+    kesto::PublisherOptions options;
+    options.root = root;
+    kesto::Publisher own;
+    ASSERT_EQ(own.open(options), Status::Ok);
+    {
+        kesto::SimpleChannel a;
+        kesto::SimpleChannel b;
+        ASSERT_EQ(a.create(own, {"amp", "Tx", "", "a"}), Status::Ok);
+        ASSERT_EQ(b.create(own, {"codec", "Tx", "", "b"}), Status::Ok);
+        EXPECT_THAT(channels(), ElementsAre("a", "b"));
+        a.destroy();
+        EXPECT_THAT(channels(), ElementsAre("b"));
+        EXPECT_FALSE(fs::exists(root / "amp"));
+    }
+    EXPECT_THAT(files(), IsEmpty());
+    EXPECT_TRUE(fs::is_empty(root));
+}
+
+TEST_F(KilledPublisherTest, APublisherIsSeenByOtherUsersWhateverItsUmask)
+{
+    constexpr uid_t nobody = 65534;
+    if (::geteuid() != 0)
+        GTEST_SKIP() << "only root can become somebody else";
+    for (const fs::path& path : {directory.path(), root})
+        fs::permissions(path, fs::perms::all);
+    const Victim living([this] {
+        ::umask(0777);
+        return ::seteuid(nobody) == 0 && publish({{"Tx", "", "a"}});
+    });
+    EXPECT_EQ(::seteuid(nobody - 1), 0);
+    const auto seen = channels();
+    EXPECT_EQ(::seteuid(0), 0);
+    EXPECT_THAT(seen, ElementsAre("a"));
+}
+
+TEST_F(KilledPublisherTest, APublisherClaimsItsFilesAnewWhenSomebodyRemovedItsOwnerFile)
+{
+    kesto::PublisherOptions options;
+    options.root = root;
+    kesto::Publisher own;
+    kesto::SimpleChannel channel;
+    ASSERT_EQ(own.open(options), Status::Ok);
+    ASSERT_EQ(channel.create(own, {"amp", "Tx", "", "a"}), Status::Ok);
+    fs::remove(root / "amp" / (".kesto-" + ownerOf(root / "amp/Tx/-/a") + ".owner"));
+    EXPECT_THAT(channels(), IsEmpty());
+    channel.add(1);
+    ASSERT_EQ(own.flush(), Status::Ok);
+    EXPECT_THAT(channels(), ElementsAre("a"));
+
+    fs::rename(root / "amp", directory.path() / "moved");
+    fs::remove_all(directory.path() / "moved");
+    fs::create_directories(root / "amp/Tx/-");
+    channel.add(1);
+    ASSERT_EQ(own.flush(), Status::Ok);
+    EXPECT_THAT(channels(), ElementsAre("a"));
+}
+
+// The administrator may have made all folders but the last one, and given only that away.
+TEST_F(KilledPublisherTest, APublisherThatMayNotClaimItsFilesWritesThemAllTheSame)
+{
+    constexpr uid_t nobody = 65534;
+    fs::permissions(directory.path(), fs::perms::all);
+    fs::create_directories(root / "amp/Tx/-");
+    if (::geteuid() != 0 || ::chown((root / "amp/Tx/-").c_str(), nobody, nobody) != 0)
+        GTEST_SKIP() << "only root can give folders away";
+    Victim killed([this] { return ::seteuid(nobody) == 0 && publish({{"Tx", "", "a"}}); });
+    EXPECT_THAT(files(), ElementsAre("amp/Tx/-/a"));
+    killed.kill();
+    EXPECT_THAT(channels(), ElementsAre("a")) << "nobody can know";
+}
+
+} // namespace

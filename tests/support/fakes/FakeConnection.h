@@ -1,0 +1,104 @@
+// A connection without a socket, seen from the client's side: the test makes calls, reads the answers, and ends the
+// connection in one way or the other.
+//
+// Every frame goes through its encoding in both directions, so that what a client can say, and what it cannot (hand
+// in an object of the service's own, for one), is what it is on a wire.
+#pragma once
+
+#include "foundation/cbor/Cbor.h"
+#include "platform/Connection.h"
+
+#include <deque>
+#include <memory>
+#include <string>
+#include <vector>
+
+namespace support {
+
+// One thread.
+class FakeConnection final : public platform::Connection, public std::enable_shared_from_this<FakeConnection> {
+public:
+    // Beyond either, no more is read from the peer.
+    static constexpr std::size_t mostUnansweredCalls = 32 * 1024;
+    static constexpr std::size_t mostUnansweredBytes = 1024 * 1024;
+
+    explicit FakeConnection(std::int32_t processIdentifier) : processIdentifier_(processIdentifier) { }
+
+    // The peer makes one call. It is delivered at once unless too much is unanswered; then it is when it can be, with
+    // the next call or with `readOn`. After a violation the connection breaks.
+    std::expected<void, Violation> call(foundation::Array frame);
+    std::expected<void, Violation> readOn();
+    // The frames that came back.
+    [[nodiscard]] const std::vector<foundation::Array>& received() const { return received_; }
+    // How many frames were sent, those of a turn that goes on included.
+    [[nodiscard]] std::size_t sent() const { return sent_; }
+    // Calls that nobody has finished working on.
+    [[nodiscard]] std::size_t unansweredCalls() const { return unansweredCalls_; }
+
+    // The peer closes the connection: it is invalidated.
+    void close();
+    // The connection breaks: it is interrupted, then invalidated. Or interrupted only, for now.
+    void breakOff();
+    void interrupt();
+    // Lets its handlers go, which hold what will answer, which holds the connection.
+    void letGo();
+
+    [[nodiscard]] bool isResumed() const { return isResumed_; }
+    [[nodiscard]] bool isOver() const { return isOver_; }
+
+    [[nodiscard]] std::int32_t processIdentifier() const override { return processIdentifier_; }
+    [[nodiscard]] std::string description() const override;
+    void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
+    void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
+    void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
+    // All handlers are installed before.
+    void resume() override;
+    void send(std::string frame) override;
+
+private:
+    class Credit;
+
+    [[nodiscard]] foundation::Array decoded(const std::string& frame);
+    [[nodiscard]] bool isBehind() const;
+    [[nodiscard]] std::expected<void, Violation> deliverNext();
+    void deliverWhatIsLeft();
+
+    const std::int32_t processIdentifier_;
+    CallHandler callHandler_;
+    EndHandler interruptionHandler_;
+    EndHandler invalidationHandler_;
+    bool isResumed_ = false;
+    bool isInterrupted_ = false;
+    bool isOver_ = false;
+    foundation::CborDecoder decoder_;
+    std::deque<std::string> unread_; // calls
+    std::vector<foundation::Array> received_;
+    std::size_t sent_ = 0;
+    std::size_t unansweredCalls_ = 0;
+    std::size_t unansweredBytes_ = 0;
+};
+
+// Hands connections to its delegate when the test has them come.
+class FakeConnectionListener final : public platform::ConnectionListener {
+public:
+    FakeConnectionListener() = default;
+    ~FakeConnectionListener() override;
+    FakeConnectionListener(const FakeConnectionListener&) = delete;
+    FakeConnectionListener& operator=(const FakeConnectionListener&) = delete;
+
+    // A process connects. The connection is over if the delegate refuses it.
+    std::shared_ptr<FakeConnection> connect(std::int32_t processIdentifier);
+
+    void setDelegate(platform::ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
+    // Keeps no thread: it is the test that has connections come.
+    void resume() override { }
+    void stop() override;
+
+private:
+    [[nodiscard]] std::vector<std::shared_ptr<FakeConnection>> living() const;
+
+    platform::ConnectionListenerDelegate* delegate_ = nullptr;
+    std::vector<std::weak_ptr<FakeConnection>> connections_;
+};
+
+} // namespace support

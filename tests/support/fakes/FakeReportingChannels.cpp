@@ -1,0 +1,106 @@
+// A sample is a copy of what is published at that moment; a difference is what the platform would make of two.
+#include "support/fakes/FakeReportingChannels.h"
+
+#include "platform/linux/channels/ChannelDifference.h"
+
+#include <algorithm>
+#include <tuple>
+
+namespace support {
+
+using platform::ReportingChannel;
+using platform::ReportingSample;
+
+// A channel set is the question that found it, and how many were found.
+struct FakeReportingChannels::Selection final : ChannelSet {
+    Selection(Name givenGroup, Name givenSubgroup)
+        : group(std::move(givenGroup)),
+          subgroup(std::move(givenSubgroup)) { }
+    Name group;
+    Name subgroup;
+    std::size_t count = 0;
+};
+
+namespace {
+
+bool isSameChannel(const ReportingChannel& left, const ReportingChannel& right)
+{
+    const auto identity = [](const ReportingChannel& channel) {
+        return std::tie(channel.driver, channel.group, channel.subgroup, channel.name);
+    };
+    return identity(left) == identity(right);
+}
+
+} // namespace
+
+void FakeReportingChannels::publish(ReportingChannel channel)
+{
+    const auto found =
+        std::ranges::find_if(channels_, [&](const auto& other) { return isSameChannel(other, channel); });
+    if (found == channels_.end())
+        channels_.push_back(std::move(channel));
+    else
+        *found = std::move(channel);
+}
+
+void FakeReportingChannels::withdraw(const ReportingChannel& channel)
+{
+    std::erase_if(channels_, [&](const auto& other) { return isSameChannel(other, channel); });
+}
+
+std::vector<ReportingChannel> FakeReportingChannels::select(const Selection& selection) const
+{
+    std::vector<ReportingChannel> selected;
+    for (const auto& channel : channels_)
+        if ((!selection.group || channel.group == selection.group)
+            && (!selection.subgroup || channel.subgroup == selection.subgroup))
+            selected.push_back(channel);
+    return selected;
+}
+
+platform::ReportingChannels::FoundChannels
+FakeReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group,
+                                           std::optional<std::string_view> subgroup)
+{
+    const auto selection = std::make_shared<Selection>(Name(group), Name(subgroup));
+    const Failures& failing = failures(selection->group, selection->subgroup);
+    selection->count = select(*selection).size();
+    asked_.emplace_back(selection->group, selection->subgroup);
+    if (failing.copiesNothing || (failing.copy && !failing.copiesAnyway))
+        return {.channels = nullptr, .error = failing.copy};
+    return {.channels = selection, .error = failing.copy};
+}
+
+std::size_t FakeReportingChannels::channelCount(const ChannelSet& channels) const
+{
+    return dynamic_cast<const Selection&>(channels).count;
+}
+
+platform::ReportingChannels::Subscribed FakeReportingChannels::createSubscription(const ChannelSet& channels)
+{
+    const auto& selection = dynamic_cast<const Selection&>(channels);
+    auto subscription = std::make_shared<Subscription>();
+    const Failures& failing = failures(selection.group, selection.subgroup);
+    if (failing.subscribesToNothing || failing.subscription)
+        return {.subscription = std::move(subscription), .channels = nullptr, .error = failing.subscription};
+    return {.subscription = std::move(subscription), .channels = std::make_shared<Selection>(selection), .error = {}};
+}
+
+std::expected<ReportingSample, platform::ReportingChannelError>
+FakeReportingChannels::createSamples(const Subscription&, const ChannelSet& channels)
+{
+    const auto& selection = dynamic_cast<const Selection&>(channels);
+    if (const auto error = failures(selection.group, selection.subgroup).sample)
+        return std::unexpected(*error);
+    return ReportingSample{select(selection)};
+}
+
+std::expected<ReportingSample, platform::ReportingChannelError>
+FakeReportingChannels::createDifference(const ReportingSample& from, const ReportingSample& to)
+{
+    if (differenceError_)
+        return std::unexpected(*differenceError_);
+    return platform::channelDifference(from, to);
+}
+
+} // namespace support

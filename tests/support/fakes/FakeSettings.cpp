@@ -1,0 +1,16 @@
+// A process's name is what is left of it when the kernel and the provider have looked at it.
+#include "support/fakes/FakeSettings.h"
+
+#include "platform/linux/files/Utf8.h"
+
+namespace support {
+
+void FakeProcessTable::add(std::int32_t processIdentifier, std::string name)
+{
+    constexpr std::size_t longestName = 15;
+    name.resize(std::min(name.size(), longestName));
+    platform::replaceWhatIsNotUtf8(name);
+    names_.insert_or_assign(processIdentifier, std::move(name));
+}
+
+} // namespace support

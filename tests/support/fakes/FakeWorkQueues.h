@@ -1,0 +1,85 @@
+// Work queues without threads: everything runs on the test's own thread when the test says so, in the order in
+// which it was submitted, and delayed work when virtual time reaches it.
+//
+// What a real serial queue promises holds here too: while one of its items waits for a semaphore, other queues
+// go on and this one does not. Each item of an interactive queue is a turn.
+#pragma once
+
+#include "platform/WorkQueue.h"
+#include "support/fakes/FakeClock.h"
+
+#include <cstddef>
+#include <deque>
+#include <string>
+#include <vector>
+
+namespace support {
+
+// One thread.
+class FakeWorkQueues final : public platform::WorkQueues {
+public:
+    struct MadeQueue {
+        std::string name;
+        platform::QualityOfService quality;
+        friend bool operator==(const MadeQueue&, const MadeQueue&) = default;
+    };
+
+    // Whether there are threads for more serial queues.
+    bool hasThreads = true;
+
+    explicit FakeWorkQueues(FakeClock& clock);
+    ~FakeWorkQueues() override;
+    FakeWorkQueues(const FakeWorkQueues&) = delete;
+    FakeWorkQueues& operator=(const FakeWorkQueues&) = delete;
+
+    // Runs what was submitted, and what that submits, until nothing is left.
+    void runAll();
+    // Runs the oldest item that may run; false when there is none.
+    bool runOne();
+    // Moves the clock on, and runs all delayed work that falls due on the way, at its time.
+    void advance(std::chrono::nanoseconds duration);
+    // Drops what has not run.
+    void discardAll();
+
+    // Runs the item when the turn that the calling thread runs is over, or here and now where it runs none.
+    static void afterTurn(platform::WorkItem item);
+
+    // How many items wait to be run.
+    [[nodiscard]] std::size_t pending() const { return items_.size(); }
+    // The queues of the items that wait for their time, in the order of time.
+    [[nodiscard]] std::vector<const platform::WorkQueue*> delayed() const;
+    // The serial queues that were made, in order.
+    [[nodiscard]] const std::vector<MadeQueue>& made() const { return made_; }
+
+    // Throws as a thread does that cannot be started.
+    std::shared_ptr<platform::WorkQueue> makeSerialQueue(std::string_view name,
+                                                         platform::QualityOfService quality) override;
+    platform::WorkQueue& backgroundQueue() override;
+    void submitAfter(std::chrono::nanoseconds delay, platform::WorkQueue& queue, platform::WorkItem item) override;
+    // Waiting for it runs other work, and throws std::logic_error when that cannot help.
+    std::unique_ptr<platform::Semaphore> makeSemaphore(unsigned initialCount) override;
+
+private:
+    class Queue;
+    class Run;
+    struct Item {
+        std::shared_ptr<Queue> queue;
+        platform::WorkItem work;
+    };
+    struct DelayedItem {
+        std::chrono::nanoseconds due;
+        platform::WorkQueue* queue;
+        platform::WorkItem work;
+    };
+    void moveTo(std::chrono::nanoseconds moment);
+
+    FakeClock& clock_;
+    std::chrono::nanoseconds now_{0};
+    std::deque<Item> items_;
+    std::vector<DelayedItem> delayed_; // by time, then by submission
+    std::vector<Queue*> running_; // innermost last
+    std::vector<MadeQueue> made_;
+    std::shared_ptr<Queue> background_;
+};
+
+} // namespace support

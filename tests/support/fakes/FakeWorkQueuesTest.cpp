@@ -1,0 +1,109 @@
+// The work queues of the tests are worth as much as they resemble real ones.
+#include "support/fakes/FakeWorkQueues.h"
+
+#include <gmock/gmock.h>
+#include <stdexcept>
+
+namespace {
+
+using namespace std::chrono_literals;
+using platform::QualityOfService;
+using testing::ElementsAre;
+
+class FakeWorkQueuesTest : public testing::Test {
+protected:
+    auto noting(std::string what)
+    {
+        return [this, what = std::move(what)] { noted.push_back(what); };
+    }
+
+    support::FakeClock clock;
+    support::FakeWorkQueues queues{clock};
+    std::shared_ptr<platform::WorkQueue> serial = queues.makeSerialQueue("one", QualityOfService::UserInteractive);
+    std::shared_ptr<platform::WorkQueue> other = queues.makeSerialQueue("two", QualityOfService::Default);
+    std::vector<std::string> noted;
+};
+
+TEST_F(FakeWorkQueuesTest, NothingRunsBeforeTheTestSaysSo)
+{
+    serial->submit(noting("a"));
+    EXPECT_THAT(noted, ElementsAre());
+    queues.runAll();
+    EXPECT_THAT(noted, ElementsAre("a"));
+}
+
+TEST_F(FakeWorkQueuesTest, ItemsRunInTheOrderOfSubmissionAndThoseTheySubmitAfterThem)
+{
+    serial->submit([this] {
+        noted.push_back("a");
+        serial->submit(noting("c"));
+    });
+    other->submit(noting("b"));
+    queues.runAll();
+    EXPECT_THAT(noted, ElementsAre("a", "b", "c"));
+}
+
+TEST_F(FakeWorkQueuesTest, DelayedItemsRunAtTheirTimeInTheOrderOfTime)
+{
+    const double start = clock.secondsSince1970();
+    queues.submitAfter(3s, *serial, [&] { EXPECT_DOUBLE_EQ(clock.secondsSince1970(), start + 3); });
+    queues.submitAfter(3s, *serial, noting("late"));
+    queues.submitAfter(1s, queues.backgroundQueue(), noting("soon"));
+    EXPECT_THAT(queues.delayed(), ElementsAre(&queues.backgroundQueue(), serial.get(), serial.get()));
+    queues.advance(999ms);
+    EXPECT_THAT(noted, ElementsAre());
+    queues.advance(4s);
+    EXPECT_THAT(noted, ElementsAre("soon", "late"));
+    EXPECT_DOUBLE_EQ(clock.secondsSince1970(), start + 4.999);
+}
+
+TEST_F(FakeWorkQueuesTest, ABackgroundItemThatWaitsForMoreOthersThanThereAreThreadsWaitsForEver)
+{
+    const auto semaphore = queues.makeSemaphore(0);
+    for (int item = 0; item < 3; ++item)
+        queues.backgroundQueue().submit([&] { semaphore->wait(); });
+    queues.backgroundQueue().submit([&] {
+        for (int item = 0; item < 3; ++item)
+            semaphore->signal();
+    });
+    queues.runAll(); // the fourth runs beside three
+    for (int item = 0; item < 4; ++item)
+        queues.backgroundQueue().submit([&] { semaphore->wait(); });
+    queues.backgroundQueue().submit([&] { semaphore->signal(); });
+    EXPECT_THROW(queues.runAll(), std::logic_error) << "the fifth does not run beside four";
+}
+
+TEST_F(FakeWorkQueuesTest, EachItemOfAnInteractiveQueueIsATurnAndNoOtherIs)
+{
+    const auto sending = [this](std::string what) {
+        return [this, what = std::move(what)] {
+            support::FakeWorkQueues::afterTurn(noting("after " + what));
+            noted.push_back(what);
+        };
+    };
+    serial->submit(sending("turn"));
+    serial->submit(noting("next"));
+    other->submit(sending("other"));
+    queues.runAll();
+    sending("here")();
+    EXPECT_THAT(noted, ElementsAre("turn", "after turn", "next", "after other", "other", "after here", "here"));
+}
+
+TEST_F(FakeWorkQueuesTest, AWaitThatWouldNeverEndIsAnError)
+{
+    const auto semaphore = queues.makeSemaphore(1);
+    semaphore->wait();
+    EXPECT_THROW(semaphore->wait(), std::logic_error);
+}
+
+TEST_F(FakeWorkQueuesTest, WhatIsDiscardedNeverRuns)
+{
+    serial->submit(noting("a"));
+    queues.submitAfter(1s, *serial, noting("b"));
+    queues.discardAll();
+    queues.advance(2s);
+    queues.runAll();
+    EXPECT_THAT(noted, ElementsAre());
+}
+
+} // namespace

@@ -1,0 +1,114 @@
+// What is said of a parameters file before anything is measured by it, and the copy that a service is given.
+#include "kesto/trace/TraceParametersFile.h"
+
+#include "support/TemporaryDirectory.h"
+
+#include <filesystem>
+#include <gmock/gmock.h>
+#include <sys/stat.h>
+
+namespace {
+
+namespace fs = std::filesystem;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+TraceDataParams interval(std::uint32_t begin, std::uint32_t end)
+{
+    return {"a", TraceDataParams::interval, begin, end, false};
+}
+
+std::vector<std::string> warningsOfPoint(const TraceDataParams& point)
+{
+    return warningsOf({.name = "T", .traceDataParams = {point}});
+}
+
+TEST(TraceParametersWarnings, AreNoneForPointsThatCanBeMeasured)
+{
+    EXPECT_THAT(warningsOf({.name = "",
+                            .traceDataParams = {interval(0x21040000, 0x2104408A),
+                                                interval(0x2104408A, 0x21040000),
+                                                {"level", TraceDataParams::level, 0x21040008, 0x2104000C, true}}}),
+                IsEmpty());
+}
+
+TEST(TraceParametersWarnings, AreGivenForCodesThatAreNotCollected)
+{
+    const std::string outside = "point 1, \"a\": measures nothing, for the code ";
+    const std::string range = " is not from 0x21040000 to 0x2104408a";
+    EXPECT_THAT(warningsOfPoint(interval(0x2103FFFF, 0x21040000)), ElementsAre(outside + "0x2103ffff" + range));
+    EXPECT_THAT(warningsOfPoint(interval(0x21040000, 0x2104408B)), ElementsAre(outside + "0x2104408b" + range));
+    EXPECT_THAT(warningsOfPoint(interval(0x21040000, 0)), ElementsAre(outside + "0x00000000" + range));
+    EXPECT_THAT(warningsOfPoint(interval(1, 1)), ElementsAre(outside + "0x00000001" + range));
+}
+
+TEST(TraceParametersWarnings, AreGivenForWhatBeginsAndNeverEnds)
+{
+    EXPECT_THAT(warningsOfPoint({"beat\x1B", TraceDataParams::impulse, 0x21040000, 0, false}),
+                ElementsAre("point 1, \"beat?\": measures nothing, for it begins and ends with one code"));
+}
+
+TEST(TraceParametersWarnings, NameEachPointByItsPlace)
+{
+    TraceDataParams unknown = interval(0x21040000, 0x21040004);
+    unknown.isTypeKnown = false;
+    EXPECT_THAT(warningsOf({.name = "", .traceDataParams = {interval(0x21040000, 0x21040004), unknown}}),
+                ElementsAre("point 2, \"a\": its type is none of Interval, Impulse and Level, so it is taken for one "
+                            "like the point before it"));
+}
+
+TEST(TraceParametersWarnings, AreGivenForTheFileAsAWhole)
+{
+    EXPECT_THAT(warningsOf({.name = "", .traceDataParams = {}, .problem = "\"Children\" holds nothing", .leftOut = 7}),
+                ElementsAre("\"Children\" holds nothing",
+                            "7 traces and points of the parameters file will be left out: no more than 1024 are read",
+                            "it has no points, so nothing will be measured"));
+}
+
+class TraceParametersCopyTest : public testing::Test {
+protected:
+    TraceParametersCopyTest() { fs::create_directories(folder); }
+
+    const support::TemporaryDirectory root;
+    const fs::path folder = root / "Audio/Traces";
+};
+
+TEST_F(TraceParametersCopyTest, IsForAllToReadAndGoesWithItsObject)
+{
+    fs::path path;
+    {
+        const mode_t before = ::umask(0777);
+        const TraceParametersCopy copy(root.path(), folder, "text");
+        ::umask(before);
+        path = copy.path();
+        EXPECT_EQ(path.parent_path(), folder);
+        EXPECT_EQ(support::readFile(path), "text");
+        EXPECT_EQ(fs::status(path).permissions(), fs::perms(0644));
+        const TraceParametersCopy other(root.path(), folder, "other");
+        EXPECT_NE(other.path(), path);
+    }
+    EXPECT_TRUE(fs::is_empty(folder));
+}
+
+TEST_F(TraceParametersCopyTest, IsNotMadeBehindALinkThatOthersPutThere)
+{
+    fs::create_directory(root / "elsewhere");
+    fs::remove(folder);
+    fs::create_directory_symlink(root / "elsewhere", folder);
+    try {
+        const TraceParametersCopy copy(root.path(), folder, "text");
+        FAIL() << copy.path();
+    } catch (const std::runtime_error& error) {
+        EXPECT_THAT(error.what(), testing::StartsWith("cannot write " + folder.native() + "/.kesto-"));
+        EXPECT_THAT(error.what(), testing::EndsWith(".plist: Not a directory"));
+    }
+    EXPECT_TRUE(fs::is_empty(root / "elsewhere"));
+}
+
+TEST_F(TraceParametersCopyTest, MayLieInTheRootItself)
+{
+    const TraceParametersCopy copy(folder, folder, "text");
+    EXPECT_EQ(support::readFile(copy.path()), "text");
+}
+
+} // namespace

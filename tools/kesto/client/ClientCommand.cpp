@@ -1,0 +1,248 @@
+// `kesto client`: every operation of the service from a shell. One JSON array a line in, one JSON object an answer
+// out, as they come.
+#include "foundation/values/Json.h"
+#include "foundation/values/Value.h"
+#include "kesto/Commands.h"
+#include "kesto/client/Call.h"
+
+#include <chrono>
+#include <condition_variable>
+#include <fmt/format.h>
+#include <iostream>
+#include <mutex>
+#include <string>
+#include <thread>
+
+namespace {
+
+using foundation::Array;
+using foundation::Dictionary;
+using foundation::Value;
+
+struct ClientOptions {
+    std::string socket;
+    double wait = 10;
+};
+
+Value valuesOf(const kesto::Answer& answer)
+{
+    switch (answer.operation()) {
+    case kesto::Operation::Send: return Array();
+    case kesto::Operation::GetServiceType: return Array{static_cast<int>(answer.serviceType())};
+    case kesto::Operation::Validate:
+        return Array{Dictionary{{"reporterID", answer.validReporter()},
+                                {"serviceType", static_cast<int>(answer.serviceType())}}};
+    case kesto::Operation::GetAllReporters: {
+        std::vector<Value> reporters;
+        for (const kesto::ReporterID reporter : answer.reporters())
+            reporters.emplace_back(reporter);
+        return Array{Value(Array(std::move(reporters)))}; // a list in a list: without Value some compilers copy it
+    }
+    default: return Array{answer.success()};
+    }
+}
+
+std::string lineOf(const kesto::Answer& answer)
+{
+    const Value error =
+        answer.ok() ? Value() : Value(Dictionary{{"domain", answer.errorDomain()}, {"code", answer.errorCode()}});
+    std::string line;
+    foundation::appendJsonText(Dictionary{{"call", answer.call()},
+                                          {"operation", operationName(answer.operation())},
+                                          {"error", error},
+                                          {"values", answer.ok() ? valuesOf(answer) : Value(Array())}},
+                               line);
+    return line;
+}
+
+// The library takes calls of a quarter of its queue, and the service of 1 MiB.
+constexpr std::size_t queueBytes = std::size_t{4} * 1024 * 1024;
+// Such a call, escaped as it may be.
+constexpr std::size_t longestLine = std::size_t{8} * 1024 * 1024;
+
+// The next line. Of one that is too long only so much is kept as shows it; false at the end of the input.
+bool readLine(std::istream& input, std::string& line)
+{
+    line.clear();
+    char character = 0;
+    while (input.get(character) && character != '\n')
+        if (line.size() <= longestLine)
+            line += character;
+    return !line.empty() || input;
+}
+
+// How many answers to wait for at the end: a start is answered when its session stops, which need not happen, and
+// the service type of no reporter is answered twice.
+std::size_t awaitedAnswers(const Call& call)
+{
+    if (call.operation == kesto::Operation::StartSession)
+        return 0;
+    return call.operation == kesto::Operation::GetServiceType && call.reporter == 0 ? 2 : 1;
+}
+
+// One run: the lines of standard input as calls, and their answers.
+class ClientRun {
+public:
+    explicit ClientRun(const ClientOptions& options) : options_(options) { }
+
+    int run()
+    {
+        kesto::Options options;
+        options.socketPath = options_.socket;
+        options.queueBytes = queueBytes;
+        options.wakeOnSend = true; // nobody here minds a system call, and somebody may be waiting
+        options.stateChanged = [this](const kesto::StateChange& change) { stateChanged(change); };
+        if (const auto status = client_.open(options); status != kesto::Status::Ok) {
+            fmt::print(stderr, "kesto client: {}\n", kesto::errorText(status));
+            return exitFailure;
+        }
+        std::string line;
+        for (unsigned number = 1; !isOver() && readLine(std::cin, line); ++number)
+            if (line.size() > longestLine || line.find_first_not_of(" \t\r") != std::string::npos)
+                carryOut(line, number);
+        waitForAnswers();
+        client_.close(std::chrono::milliseconds(0));
+        return hasFailed_ ? exitFailure : exitOk;
+    }
+
+private:
+    void carryOut(std::string_view line, unsigned number)
+    {
+        const auto call = line.size() > longestLine ? std::unexpected(fmt::format("longer than {} bytes", longestLine))
+                                                    : parseCall(line);
+        if (!call) {
+            fmt::print(stderr, "kesto client: line {}: {}\n", number, call.error());
+            const std::scoped_lock lock(lock_);
+            hasFailed_ = true;
+            return;
+        }
+        const std::size_t awaited = awaitedAnswers(*call);
+        {
+            const std::scoped_lock lock(lock_);
+            unanswered_ += awaited;
+            isKilling_ |= call->operation == kesto::Operation::KillService;
+        }
+        kesto::Status status = submit(*call);
+        while (status == kesto::Status::QueueFull) {
+            client_.flush(std::chrono::milliseconds(100));
+            status = submit(*call);
+        }
+        if (status == kesto::Status::Ok)
+            return;
+        std::unique_lock lock(lock_);
+        unanswered_ -= awaited;
+        if (status == kesto::Status::NotConnected) // which `stateChanged` is about to tell, in better words
+            changed_.wait_for(lock, std::chrono::duration<double>(options_.wait), [this] { return isOver_; });
+        if (!isOver_)
+            fmt::print(stderr, "kesto client: line {}: {}\n", number, kesto::errorText(status));
+        hasFailed_ = true;
+    }
+
+    kesto::Status submit(const Call& call)
+    {
+        const auto answered = [this](const kesto::Answer& answer) { print(answer); };
+        switch (call.operation) {
+        case kesto::Operation::CreateSession: return client_.createSession(call.reporter, answered);
+        case kesto::Operation::SetServiceType: return client_.setServiceType(call.serviceType, call.reporter, answered);
+        case kesto::Operation::GetServiceType: return client_.getServiceType(call.reporter, answered);
+        case kesto::Operation::SetConfiguration: return client_.setConfiguration(call.message, call.reporter, answered);
+        case kesto::Operation::StartSession: return client_.startSession(call.reporter, answered);
+        case kesto::Operation::Send:
+            return client_.send(call.message, call.category, call.type,
+                                call.reporters ? kesto::Reporters(*call.reporters) : kesto::Reporters::allStarted(),
+                                answered);
+        case kesto::Operation::StopSession: return client_.stopSession(call.reporter, answered);
+        case kesto::Operation::DestroySession: return client_.destroySession(call.reporter, answered);
+        case kesto::Operation::Validate: return client_.validate(call.reporter, answered);
+        case kesto::Operation::GetAllReporters: return client_.getAllReporters(answered);
+        case kesto::Operation::KillService: return client_.killService(answered);
+        }
+        return kesto::Status::InvalidArgument;
+    }
+
+    // On the library's thread, as what follows.
+    void print(const kesto::Answer& answer)
+    {
+        if (answer.status() == kesto::Status::ConnectionLost)
+            return; // no answer of the service's; that the connection is over is told behind it
+        const std::scoped_lock lock(lock_);
+        if (answer.operation() != kesto::Operation::StartSession && unanswered_ > 0)
+            --unanswered_;
+        changed_.notify_all();
+        if (isFinished_)
+            return;
+        const std::string line = lineOf(answer) + '\n';
+        std::fwrite(line.data(), 1, line.size(), stdout); // what cannot be written is told at the end
+        std::fflush(stdout);
+    }
+
+    void stateChanged(const kesto::StateChange& change)
+    {
+        if (change.state != kesto::State::Disconnected)
+            return;
+        const std::scoped_lock lock(lock_);
+        isOver_ = true;
+        changed_.notify_all();
+        if (isFinished_ || (isKilling_ && change.reason == kesto::Status::ConnectionLost))
+            return;
+        hasFailed_ = true;
+        const std::string why = change.systemError == 0
+            ? std::string()
+            : fmt::format(" ({})", std::generic_category().message(change.systemError));
+        fmt::print(stderr, "kesto client: {}: {}{}; is kestod running?\n", change.socketPath,
+                   kesto::errorText(change.reason), why);
+    }
+
+    [[nodiscard]] bool isOver()
+    {
+        const std::scoped_lock lock(lock_);
+        return isOver_;
+    }
+
+    void waitForAnswers()
+    {
+        std::unique_lock lock(lock_);
+        const bool isDone = changed_.wait_for(lock, std::chrono::duration<double>(options_.wait),
+                                              [this] { return isOver_ || unanswered_ == 0; });
+        isFinished_ = true;
+        if (isDone)
+            return;
+        fmt::print(stderr, "kesto client: {} answers did not come within {} s\n", unanswered_, options_.wait);
+        hasFailed_ = true;
+    }
+
+    const ClientOptions& options_;
+    std::mutex lock_;
+    std::condition_variable changed_;
+    std::size_t unanswered_ = 0; // answers that are waited for
+    bool isKilling_ = false;
+    bool isOver_ = false; // the connection
+    bool isFinished_ = false; // waiting for answers
+    bool hasFailed_ = false;
+    kesto::Client client_; // ends first: its thread calls what is above
+};
+
+} // namespace
+
+void addClientCommand(CLI::App& application, int& exitStatus)
+{
+    const auto options = std::make_shared<ClientOptions>();
+    CLI::App* command = application.add_subcommand("client", "Calls the operations of the service, one a line");
+    command->add_option("--socket", options->socket, "The service's socket, if it is not at its usual place");
+    command->add_option("--wait", options->wait, "How many seconds to wait for the last answers")
+        ->check(CLI::NonNegativeNumber)
+        ->capture_default_str();
+    command->footer(R"(Each line of standard input is a JSON array:
+  ["create", 42]
+  ["setServiceType", "longformaudio", 42]
+  ["setConfiguration", {"HostApplicationDisplayID": "org.example.player"}, 42]
+  ["start", 42]                    answered when the session is stopped; where kernel traces are on,
+                                   that of a session of the type "test" is answered at once, too
+  ["send", {"volume": 0.5}, "Playback", "Start", [42]]     null in place of the list: all started sessions
+  ["getServiceName", 42]  ["validate", 42]  ["getAllReporters"]
+  ["stop", 42]  ["destroy", 42]  ["kill"]
+Each answer is a line of standard output:
+  {"call":1,"operation":"createReportingSession","error":null,"values":[true]}
+Exit status: 0, or 1 when a line was wrong, the connection was lost or an answer did not come.)");
+    command->callback([options, &exitStatus] { exitStatus = ClientRun(*options).run(); });
+}

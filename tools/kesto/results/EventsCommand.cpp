@@ -1,0 +1,197 @@
+// `kesto events`: the stored events, as a table for people or as JSON lines for programs, and on request those that
+// are still to come.
+#include "foundation/text/LocalTime.h"
+#include "foundation/values/Json.h"
+#include "kesto/Commands.h"
+#include "kesto/Places.h"
+#include "kesto/Terminal.h"
+#include "kesto/files/JsonReader.h"
+#include "kesto/results/EventStore.h"
+#include "kesto/results/Moment.h"
+
+#include <array>
+#include <chrono>
+#include <cmath>
+#include <cstdio>
+#include <fmt/format.h>
+#include <memory>
+#include <optional>
+#include <stdexcept>
+#include <string>
+
+namespace {
+
+struct EventsOptions {
+    std::filesystem::path database;
+    EventFilter filter;
+    std::string since;
+    bool isJson = false;
+    bool isFollowing = false;
+};
+
+class Table {
+public:
+    void printHead() const
+    {
+        fmt::print("{} {} {} {}\n", padded("TIME", timeColumns), padded("EVENT", nameColumns),
+                   padded("APPLICATION", applicationColumns), "PAYLOAD");
+    }
+
+    void print(const StoredEvent& event) const
+    {
+        constexpr std::string_view prefix = "com.quarn.";
+        const std::string_view name = event.name.starts_with(prefix)
+            ? std::string_view(event.name).substr(prefix.size())
+            : std::string_view(event.name);
+        std::string application;
+        const std::string payload = describe(event.payload, application);
+        const std::size_t used = timeColumns + nameColumns + applicationColumns + 3;
+        fmt::print("{} {} {} {}\n", padded(timeText(event.time), timeColumns),
+                   padded(fitted(printable(name), nameColumns), nameColumns),
+                   padded(fitted(printable(application), applicationColumns), applicationColumns),
+                   fitted(printable(payload), columnsBehind(used, width_)));
+    }
+
+private:
+    static constexpr std::size_t timeColumns = 23;
+    static constexpr std::size_t nameColumns = 34;
+    static constexpr std::size_t applicationColumns = 22;
+
+    static std::string timeText(double time)
+    {
+        if (!std::isfinite(time))
+            return "?";
+        return foundation::localTimeText(time, "{:%Y-%m-%d %H:%M:%S}")
+            + fmt::format(".{:03}", static_cast<int>((time - std::floor(time)) * 1000));
+    }
+
+    // "key=value key=value", but for the application, which has a column of its own.
+    static std::string describe(const std::string& payload, std::string& application)
+    {
+        const auto value = parseJson(payload);
+        const auto entries = value ? value->dictionary() : std::nullopt;
+        if (!entries)
+            return payload;
+        std::string description;
+        for (const auto& [key, entry] : *entries) {
+            const std::string_view name = key.view();
+            if (name == "HostApplicationDisplayID" || name == "processName")
+                application = shownText(entry);
+            else
+                description += fmt::format("{}{}={}", description.empty() ? "" : " ", name, shownText(entry));
+        }
+        return description;
+    }
+
+    const std::size_t width_ = outputWidth();
+};
+
+void printJson(const StoredEvent& event)
+{
+    std::string name;
+    foundation::appendJsonText(event.name, name);
+    fmt::print("{{\"id\":{},\"time\":{},\"name\":{},\"payload\":{}}}\n", event.id, event.time, name, event.payload);
+}
+
+class EventsRun {
+public:
+    explicit EventsRun(const EventsOptions& options)
+        : options_(options),
+          filter_(options.filter),
+          store_(options.database)
+    {
+    }
+
+    void run()
+    {
+        if (!options_.isJson)
+            table_.printHead();
+        if (filter_.mostRecent == 0)
+            passOver();
+        else
+            print();
+        if (!options_.isFollowing)
+            return;
+        filter_.mostRecent.reset();
+        follow();
+    }
+
+private:
+    // Makes all that is there count as seen.
+    void passOver()
+    {
+        filter_.mostRecent = 1;
+        store_.forEach(filter_, [this](const StoredEvent& event) { filter_.afterID = event.id; });
+    }
+
+    // The log is written first, and only then the commit can be seen, on a slow disk much later: so after each change
+    // it is looked a few times. A store that is just being made cannot be read yet; only if that lasts it is an error.
+    [[noreturn]] void follow()
+    {
+        using std::chrono::milliseconds;
+        constexpr std::array<milliseconds, 5> pauses{milliseconds(10), milliseconds(50), milliseconds(250),
+                                                     milliseconds(1000), milliseconds(5000)};
+        const DatabaseWatch watch(options_.database);
+        for (std::size_t looks = 0;;) {
+            try {
+                if (store_.refresh())
+                    filter_.afterID = 0;
+                print();
+            } catch (const EventStoreError&) {
+                if (looks == pauses.size())
+                    throw;
+            }
+            const bool isChanged =
+                watch.wait(looks < pauses.size() ? std::optional(pauses[looks]) : std::optional<milliseconds>());
+            looks = isChanged ? 0 : looks + 1;
+        }
+    }
+
+    void print()
+    {
+        store_.forEach(filter_, [this](const StoredEvent& event) {
+            filter_.afterID = event.id;
+            if (options_.isJson)
+                printJson(event);
+            else
+                table_.print(event);
+        });
+        if (std::fflush(stdout) != 0)
+            throw std::runtime_error("the output could not be written");
+    }
+
+    const EventsOptions& options_;
+    EventFilter filter_;
+    EventStore store_;
+    Table table_;
+};
+
+} // namespace
+
+void addEventsCommand(CLI::App& application, int& exitStatus)
+{
+    const auto options = std::make_shared<EventsOptions>();
+    CLI::App* command = application.add_subcommand("events", "Lists the stored events, the most recent last");
+    command->add_option("--database", options->database, "The event store, if it is not at its usual place");
+    command->add_option("--name", options->filter.namePattern,
+                        "Only events of names that match, such as 'com.quarn.*.Volume.*'");
+    command->add_option("--since", options->since,
+                        "Only events since then: 90s, 10m, 2h, 7d ago, or a time such as 2026-01-31T18:00:00");
+    command->add_option("--count", options->filter.mostRecent, "At most so many, the most recent ones")
+        ->check(CLI::NonNegativeNumber);
+    command->add_flag("--follow", options->isFollowing, "Go on with events as they come");
+    command->add_flag("--json", options->isJson, "One JSON object a line, for programs");
+    command->callback([options, &exitStatus] {
+        if (options->database.empty())
+            options->database = usualDatabase();
+        if (!options->since.empty()) {
+            const auto since = parseMoment(options->since);
+            if (!since)
+                throw CLI::ValidationError(
+                    "--since", "\"" + options->since + "\" is no time: write 90s, 10m, 2h, 7d or 2026-01-31T18:00:00");
+            options->filter.since = *since;
+        }
+        EventsRun(*options).run();
+        exitStatus = exitOk;
+    });
+}

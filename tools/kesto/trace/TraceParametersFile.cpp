@@ -1,0 +1,99 @@
+// The file is understood by the service's own code, so that what is said of it is what the service will do.
+#include "kesto/trace/TraceParametersFile.h"
+
+#include "foundation/plist/PropertyList.h"
+#include "kesto/Terminal.h"
+#include "kesto/files/InputFile.h"
+#include "platform/linux/diagnostics/LinuxFileSystem.h"
+#include "tracing/TraceParamsParser.h"
+
+#include <algorithm>
+#include <fmt/format.h>
+#include <random>
+#include <stdexcept>
+#include <system_error>
+#include <unistd.h>
+
+namespace fs = std::filesystem;
+
+namespace {
+
+bool isCollected(std::uint32_t code)
+{
+    return code >= firstTraceCode && code <= lastTraceCode;
+}
+
+// Empty for a point that can be.
+std::string whyNeverMeasured(const TraceDataParams& point)
+{
+    for (const std::uint32_t code : {point.beginCode, point.endCode})
+        if (!isCollected(code))
+            return fmt::format("the code {:#010x} is not from {:#x} to {:#x}", code, firstTraceCode, lastTraceCode);
+    return point.beginCode == point.endCode ? "it begins and ends with one code" : "";
+}
+
+fs::path pathOfCopy(const fs::path& folder)
+{
+    std::random_device random;
+    return folder / fmt::format(".kesto-{:08x}{:08x}.plist", random(), random());
+}
+
+} // namespace
+
+TraceParametersFile readTraceParameters(const fs::path& path)
+{
+    TraceParametersFile file{.path = fs::absolute(path), .text = {}, .params = {}};
+    file.text = readInput(file.path, foundation::PropertyListLimits().bytes);
+    const auto list = foundation::readPropertyList(file.text);
+    if (!list)
+        throw std::runtime_error(
+            fmt::format("{} is no parameters file: {}", printable(file.path.native()), printable(list.error().text)));
+    file.params = *TraceParamsParser::paramsOf(*list);
+    if (file.params.traceType == TraceParams::signpostTrace)
+        throw std::runtime_error(fmt::format("{} asks for a trace of signposts ({} is {}), which there is none of",
+                                             printable(file.path.native()), TraceDataType, TraceDataTypeOSSignpost));
+    return file;
+}
+
+std::vector<std::string> warningsOf(const TraceParams& params)
+{
+    std::vector<std::string> warnings;
+    if (!params.problem.empty())
+        warnings.push_back(params.problem);
+    if (params.leftOut != 0)
+        warnings.push_back(fmt::format("{} traces and points of the parameters file will be left out: no more than {} "
+                                       "are read",
+                                       params.leftOut, TraceParamsParser::mostTracesAndPoints));
+    if (params.traceDataParams.empty())
+        warnings.emplace_back("it has no points, so nothing will be measured");
+    for (std::size_t index = 0; index < params.traceDataParams.size(); ++index) {
+        const TraceDataParams& point = params.traceDataParams[index];
+        const std::string which = fmt::format("point {}, \"{}\": ", index + 1, printable(point.name));
+        if (!point.isTypeKnown)
+            warnings.push_back(which
+                               + "its type is none of Interval, Impulse and Level, so it is taken for one like the "
+                                 "point before it");
+        if (const std::string why = whyNeverMeasured(point); !why.empty())
+            warnings.push_back(fmt::format("{}measures nothing, for {}", which, why));
+    }
+    return warnings;
+}
+
+TraceParametersCopy::TraceParametersCopy(const fs::path& root, const fs::path& folder, std::string_view text)
+    : path_(pathOfCopy(folder))
+{
+    const auto fail = [this](const std::error_code& error) {
+        throw std::runtime_error(fmt::format("cannot write {}: {}", printable(path_.native()), error.message()));
+    };
+    auto file = platform::LinuxFileSystem(root).createAtomically(path_);
+    if (!file)
+        fail(file.error());
+    (*file)->write(text);
+    if (const auto written = (*file)->commit(); !written)
+        fail(written.error());
+}
+
+TraceParametersCopy::~TraceParametersCopy()
+{
+    ::unlink(path_.c_str());
+}
