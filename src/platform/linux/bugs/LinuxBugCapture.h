@@ -1,3 +1,6 @@
+// The room of bugs: snapshots of what can be known when something goes wrong. It reads /proc and writes below the
+// directory of captures.
+//
 // The bug-capture service: a folder a snapshot, below the state directory, for whoever looks into it later.
 //
 // A snapshot holds what the service said last and which sessions it had, what the kernel tells of the process in which

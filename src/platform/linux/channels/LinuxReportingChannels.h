@@ -1,3 +1,6 @@
+// The room of channels: the figures that drivers publish. It reads the channel tree and /proc/asound, and writes
+// nothing.
+//
 // The reporting channels of this system: those that programs publish in the channel tree, and what the kernel tells
 // about its sound cards.
 //

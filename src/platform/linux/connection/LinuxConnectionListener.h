@@ -1,3 +1,7 @@
+// The room of connections: the socket of the service, its clients' connections, and the frames that they exchange. It
+// touches sockets and epoll. It hands calls to a queue and a page of trace markers to clients that ask; it knows
+// neither what a call means nor what becomes of it.
+//
 // Accepts the connections of the socket under which the service is reached, and is the connection thread of all
 // of them: the thread that resumes the listener waits for all sockets at once and wakes for nothing else.
 //

@@ -1,3 +1,5 @@
+// The room of diagnostics: the folders below the diagnostic-log root, their files, and how many of these are kept.
+//
 // Folders and files of the service's own, and files that clients name, on the real file system.
 //
 // A file is written under a name of its own beside its place and then renamed, so that whoever reads it sees the

@@ -1,3 +1,5 @@
+// The room of files: what all other rooms need to touch a file safely. It knows no place and no content.
+//
 // Files and folders by their names in a folder that is open: one step at a time, and never through a link. Wherever a
 // link was put, what is read, written or removed is what the folder itself holds.
 #pragma once

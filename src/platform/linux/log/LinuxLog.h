@@ -1,3 +1,6 @@
+// The room of the log: lines to journald or to a descriptor, the levels that are wanted, and the last lines for a
+// snapshot. It touches journald's socket and one descriptor.
+//
 // The log: journald where the service runs under it, standard error elsewhere.
 //
 // To the journal goes one datagram a line in its native protocol, with the category and the place of the

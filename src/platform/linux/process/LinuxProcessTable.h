@@ -1,3 +1,5 @@
+// The room of processes: other processes, this one's threads and clock, and the service manager that started it.
+//
 // The process table as /proc shows it.
 //
 // The sender's name is asked for with every message, so what was read is believed for a second. That a process

@@ -1,3 +1,6 @@
+// The room of settings: preferences, features, device properties and notifications. It reads the configuration
+// directory, watches it with inotify, and never writes there.
+//
 // Notices when files of the configuration directory change, whichever way that happens: written in place,
 // replaced, removed, or come to be with a directory that was not there before.
 //

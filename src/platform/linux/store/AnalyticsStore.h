@@ -1,3 +1,6 @@
+// The room of the store: from an event that was sent to a row on the disk. It alone touches SQLite and the state
+// directory's database.
+//
 // The analytics service: events go to a database that anyone can query with SQL.
 //
 // Acknowledged means kept: whoever works in turns ends each with `endTurn`, and is told when everything that the

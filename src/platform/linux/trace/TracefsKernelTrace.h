@@ -1,3 +1,6 @@
+// The room of traces: events into the kernel's trace, out of it again, and the files of what was measured. It alone
+// touches tracefs.
+//
 // The kernel event trace service, on an instance of tracefs that is the service's own.
 //
 // All sessions share the instance: there is one ring buffer a processor, which everybody who emits writes to, and each
