@@ -147,6 +147,20 @@ TEST_F(LaunchConfigurationTest, SaysWhatIsNotADirectory)
     }
 }
 
+TEST_F(LaunchConfigurationTest, SaysWhichDirectoryCannotBeReached)
+{
+    fs::create_directory_symlink("loop", root / "loop");
+    for (const char* name : {"RUNTIME_DIRECTORY", "STATE_DIRECTORY", "LOGS_DIRECTORY", "CONFIGURATION_DIRECTORY"}) {
+        const std::string before = std::getenv(name);
+        set(name, root / "loop/below");
+        EXPECT_EQ(problem(),
+                  std::string(name) + ": " + (root / "loop/below").string()
+                      + " cannot be reached (Too many levels of symbolic links): let the user of the service search "
+                        "the directories above it");
+        set(name, before);
+    }
+}
+
 TEST_F(LaunchConfigurationTest, SaysWhichDirectoryCannotBeWrittenTo)
 {
     // As a user who does not own it, which a privileged test has to become first.

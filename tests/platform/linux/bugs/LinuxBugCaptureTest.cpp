@@ -95,6 +95,8 @@ TEST_F(LinuxBugCaptureTest, TellsWhereTheSnapshotIs)
                                        {"snapshot", "00000001-20270115T080000Z"},
                                        {"directory", (captures / "00000001-20270115T080000Z").native()}}));
     EXPECT_EQ(json("response.json"), responses[0]) << "as it was told";
+    EXPECT_THAT(log.recentLines().text(),
+                HasSubstr("captured a bug: " + (captures / "00000001-20270115T080000Z").native()));
 }
 
 TEST_F(LinuxBugCaptureTest, KeepsWhatWasSeenWhatWasSaidAndHowTheDeviceWas)

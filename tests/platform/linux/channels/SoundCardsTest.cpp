@@ -148,6 +148,26 @@ TEST_F(SoundCardsTest, AreNamedByTheirFolderWhenTheyHaveNoName)
     EXPECT_EQ(read().front().driver, "card1");
 }
 
+TEST_F(SoundCardsTest, HaveNoMoreStreamsThanAreRead)
+{
+    const fs::path device = root / "card0/pcm0p";
+    for (int number = 0; number < 1025; ++number) {
+        fs::create_directories(device / ("sub" + std::to_string(number)));
+        support::writeFile(device / ("sub" + std::to_string(number)) / "status", "closed\n");
+    }
+    const auto names = namesOf(read());
+    EXPECT_THAT(names, SizeIs(2 * 1024));
+    EXPECT_EQ(names.back(), "card0/Tx/pcm0p/sub1023 appl_ptr");
+}
+
+TEST_F(SoundCardsTest, TellNoLongerTimeThanANumberHolds)
+{
+    plug("usb-headset");
+    support::writeFile(root / "card1/pcm0p/sub0/status",
+                       "state: RUNNING\ntrigger_time: 1.000\ntstamp: 9223372036854775807.999\n");
+    EXPECT_THAT(state("Headset/Tx/pcm0p/sub0 state"), Pair("RUNNING", 9'223'372'036'854'773'999U));
+}
+
 TEST_F(SoundCardsTest, LoseNothingButAStreamThatCannotBeUnderstood)
 {
     plug("usb-headset");

@@ -53,6 +53,34 @@ protected:
         return names;
     }
 
+    // In a process of its own, which owns the files and may read the folder, but not write to it.
+    template <typename Body> [[nodiscard]] bool isTrueWithoutRightToRemove(Body body) const
+    {
+        constexpr uid_t nobody = 65534;
+        const pid_t child = ::fork();
+        if (child == 0) {
+            if (::geteuid() == 0) {
+                for (const auto& entry : fs::directory_iterator(folder))
+                    (void)::chown(entry.path().c_str(), nobody, nobody);
+                fs::permissions(root.path(), fs::perms(0755));
+                if (::setegid(nobody) != 0 || ::seteuid(nobody) != 0)
+                    ::_exit(2);
+            } else {
+                fs::permissions(folder, fs::perms(0555));
+            }
+            ::_exit(body() ? 0 : 1);
+        }
+        int status = 0;
+        EXPECT_EQ(::waitpid(child, &status, 0), child);
+        fs::permissions(folder, fs::perms(0755));
+        return status == 0;
+    }
+    [[nodiscard]] bool hasSaidOnly(const std::string& message) const
+    {
+        const auto lines = log.lines();
+        return lines.size() == 1 && lines[0].level == Error && lines[0].message == message;
+    }
+
     const fs::file_time_type epoch = fs::file_time_type::clock::now() - std::chrono::hours(1000);
     const support::TemporaryDirectory root;
     const fs::path folder = root / "Audio/Notes";
@@ -240,36 +268,25 @@ TEST_F(FolderKeeper, SaysOnceWhatItCannotRemove)
     queues.runAll();
     for (int number = 9; number <= 11; ++number)
         make("note-" + std::to_string(number), number);
-    // In a process of its own, without root's right to write everywhere.
-    const pid_t child = ::fork();
-    if (child == 0) {
-        constexpr uid_t nobody = 65534;
-        if (::geteuid() == 0) {
-            for (const auto& entry : fs::directory_iterator(folder))
-                (void)::chown(entry.path().c_str(), nobody, nobody);
-            fs::permissions(root.path(), fs::perms(0755));
-            if (::setegid(nobody) != 0 || ::seteuid(nobody) != 0)
-                ::_exit(2);
-        } else {
-            fs::permissions(folder, fs::perms(0555));
-        }
+    EXPECT_TRUE(isTrueWithoutRightToRemove([&] {
         files.keepWithin(folder, kept, 1);
         queues.runAll();
         files.keepWithin(folder, kept, 1);
-        const bool isQuiet = queues.pending() == 0;
-        const auto lines = log.lines();
-        ::_exit(isQuiet && lines.size() == 1 && lines[0].level == Error
-                        && lines[0].message
-                            == "5 of the oldest files cannot be removed from " + folder.string()
-                                + " (Permission denied)"
-                    ? 0
-                    : 1);
-    }
-    int status = 0;
-    ASSERT_EQ(::waitpid(child, &status, 0), child);
-    fs::permissions(folder, fs::perms(0755));
-    EXPECT_EQ(status, 0);
+        return queues.pending() == 0
+            && hasSaidOnly("5 of the oldest files cannot be removed from " + folder.string() + " (Permission denied)");
+    }));
     EXPECT_THAT(names(), SizeIs(11));
+}
+
+TEST_F(FolderKeeper, SaysThatItCannotRemoveWhatAKilledServiceHadBegunToWrite)
+{
+    make(".kestod-0123456789abcdef.tmp", 0);
+    EXPECT_TRUE(isTrueWithoutRightToRemove([&] {
+        files.removeUnfinished(folder);
+        return hasSaidOnly("what a service which was killed had begun to write in " + folder.string()
+                           + " cannot be removed (Permission denied)");
+    }));
+    EXPECT_THAT(names(), ElementsAre(".kestod-0123456789abcdef.tmp"));
 }
 
 } // namespace

@@ -326,6 +326,20 @@ TEST_F(LinuxPreferencesTest, WithoutRoomForAWatchTheServiceGoesOnAndSaysSo)
     EXPECT_EQ(preferences->value("com.quarn.kesto", "device_name"), Value("Kitchen"));
 }
 
+TEST_F(LinuxPreferencesTest, SaysWhichDirectoryItCannotWatch)
+{
+    fs::create_directory_symlink("configuration", root); // to itself
+    makePreferences();
+    EXPECT_THAT(
+        log.take(),
+        ElementsAre(support::IsLine(LogLevel::Error, "kerl",
+                                    "changes of the configuration in " + root.string()
+                                        + " will take effect at the next start only: " + (root / "preferences").string()
+                                        + ": Too many levels of symbolic links; raising "
+                                          "fs.inotify.max_user_instances or fs.inotify.max_user_watches may "
+                                          "help")));
+}
+
 // --- Feature flags and device properties
 
 class LinuxSettingsTest : public testing::Test {

@@ -485,19 +485,16 @@ TEST_F(EventWriterTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
     const pid_t child = ::fork();
     if (child == 0) {
         ::signal(SIGXFSZ, SIG_IGN);
-        const auto limitFiles = [](rlim_t bytes) {
-            rlimit limit{};
-            ::getrlimit(RLIMIT_FSIZE, &limit);
-            limit.rlim_cur = bytes;
-            ::setrlimit(RLIMIT_FSIZE, &limit);
-        };
+        rlimit limit{};
+        ::getrlimit(RLIMIT_FSIZE, &limit);
+        const rlimit small{200'000, limit.rlim_max};
         keep(events(10));
-        limitFiles(200'000);
+        ::setrlimit(RLIMIT_FSIZE, &small);
         for (int round = 0; round < 10; ++round)
             keep(events(200));
         EXPECT_GT(lost(StoreError::DiskFull), 0U);
         EXPECT_EQ(writer().keptEvents() + lost(StoreError::DiskFull), 2010U);
-        limitFiles(RLIM_INFINITY);
+        ::setrlimit(RLIMIT_FSIZE, &limit);
         const std::uint64_t before = writer().keptEvents();
         keep(events(200));
         EXPECT_EQ(writer().keptEvents(), before + 200);

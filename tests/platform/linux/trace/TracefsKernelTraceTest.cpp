@@ -9,11 +9,13 @@
 #include <algorithm>
 #include <atomic>
 #include <condition_variable>
+#include <csignal>
 #include <deque>
 #include <gmock/gmock.h>
 #include <map>
 #include <mutex>
 #include <sys/mman.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 
 namespace platform {
@@ -284,6 +286,22 @@ TEST_F(TracefsKernelTraceTest, CountsAsOffWithoutTracefsAndSaysSoOnce)
     EXPECT_TRUE(trace.isAvailable()) << "what was missing came";
     EXPECT_NE(trace.createTraceSession(), nullptr);
     EXPECT_THAT(log.take(), IsEmpty());
+}
+
+TEST_F(TracefsKernelTraceTest, TracesAlsoWhenClientsCannotEmitAndSaysSo)
+{
+    // No file may become as large as the page that clients map.
+    rlimit before = {};
+    ASSERT_EQ(::getrlimit(RLIMIT_FSIZE, &before), 0);
+    const rlimit small = {.rlim_cur = TraceMarkerPage::size - 1, .rlim_max = before.rlim_max};
+    const auto handler = std::signal(SIGXFSZ, SIG_IGN);
+    ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &small), 0);
+    const auto session = trace.createTraceSession();
+    ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &before), 0);
+    std::signal(SIGXFSZ, handler);
+    EXPECT_NE(session, nullptr);
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(LogLevel::Error, "kerl", "clients cannot emit trace events: File too large")));
 }
 
 TEST_F(TracefsKernelTraceTest, SaysWhatIsForbidden)
