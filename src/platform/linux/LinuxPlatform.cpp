@@ -7,8 +7,8 @@
 namespace platform {
 namespace {
 
-// By which notification the owner of a preferences domain tells that it changed; empty for domains that tell
-// nothing.
+// By which notification the owner of a preferences domain tells that it changed. Domains that tell nothing have the
+// empty name, under which nothing can be registered.
 std::string_view notificationOf(std::string_view domain)
 {
     if (domain == "com.quarn.kesto")
@@ -41,10 +41,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       performanceWriter_(fileSystem_, ProviderLog(log_)),
       analytics_(launch.stateDirectory, configurationWatcher_, clock_, ProviderLog(log_))
 {
-    preferences_.setChangeHandler([this](std::string_view domain) {
-        if (const auto name = notificationOf(domain); !name.empty())
-            notifications_.post(name);
-    });
+    preferences_.setChangeHandler([this](std::string_view domain) { notifications_.post(notificationOf(domain)); });
     // The replies of a turn leave once its events are kept.
     workQueues_.setTurnEndHandler([this] { analytics_.endTurn(Outbox::endTurn()); });
 }

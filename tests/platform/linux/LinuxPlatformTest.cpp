@@ -53,6 +53,23 @@ TEST_F(LinuxPlatformTest, EveryProviderReadsWhatTheLaunchConfigurationNames)
               platform.processTable.ownProcessName());
 }
 
+TEST_F(LinuxPlatformTest, PreferencesThatChangePostTheNotificationOfTheirDomain)
+{
+    for (const auto& [domain, notification] :
+         {std::pair("com.quarn.kesto", "com.quarn.kesto.reporting"),
+          std::pair("com.quarn.halden", "com.quarn.halden.spatial-audio-accessory-feature.changed")}) {
+        LinuxPlatform providers(launch());
+        const Platform platform = providers.platform();
+        const auto posted = std::make_shared<std::promise<void>>();
+        const auto queue = platform.workQueues.makeSerialQueue("posts", QualityOfService::Default);
+        platform.notifications.registerNotification(notification, queue,
+                                                    [posted](std::int32_t) { posted->set_value(); });
+        fs::create_directories(make("etc") / "preferences");
+        support::replaceFile(make("etc") / "preferences" / (std::string(domain) + ".toml"), "key = 1");
+        EXPECT_EQ(posted->get_future().wait_for(std::chrono::seconds(20)), std::future_status::ready) << domain;
+    }
+}
+
 TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)
 {
     LinuxPlatform providers(launch());

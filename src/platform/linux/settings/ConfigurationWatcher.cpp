@@ -166,7 +166,7 @@ void ConfigurationWatcher::handleEvents()
         else if ((event.mask & (endsOfDirectories | IN_IGNORED | IN_UNMOUNT)) != 0
                  || place->second.awaited.contains(fileName))
             structureChanged = true;
-        else if (place->second.isWanted && !fileName.empty())
+        else if (!fileName.empty())
             tell(place->second.directory, fileName, (event.mask & writesOfFiles) != 0);
     }
     if (!structureChanged && !eventsWereLost)

@@ -5,7 +5,6 @@
 #include "platform/linux/queues/SerialQueue.h"
 
 #include <future>
-#include <iterator>
 #include <utility>
 
 namespace platform {
@@ -16,13 +15,6 @@ constexpr std::size_t mostRoomKept = 1024; // in turns that wait; what a burst n
 
 // --- Batches
 
-void AnalyticsStore::Batch::takeFrom(Batch& other)
-{
-    events.takeFrom(other.events);
-    std::ranges::move(other.whenKept, std::back_inserter(whenKept));
-    other.clear();
-}
-
 void AnalyticsStore::Batch::clear()
 {
     events.clear();
@@ -31,9 +23,9 @@ void AnalyticsStore::Batch::clear()
         whenKept = std::vector<WhenKept>();
 }
 
-bool AnalyticsStore::isRoomIn(const Batch& batch) const noexcept
+bool AnalyticsStore::isRoomBeside(const EventBatch& events, std::size_t waiters) const noexcept
 {
-    return batch.events.size() + batch.whenKept.size() < limits_.mostEvents && batch.events.bytes() < limits_.mostBytes;
+    return events.size() + waiters < limits_.mostEvents && events.bytes() < limits_.mostBytes;
 }
 
 // --- What others call
@@ -54,7 +46,7 @@ AnalyticsStore::~AnalyticsStore()
 {
     {
         const foundation::Lock lock(lock_);
-        waiting_.takeFrom(turn_);
+        waiting_.events.takeFrom(turn_);
         isEnding_ = true;
         wakeWriter();
     }
@@ -69,10 +61,10 @@ void AnalyticsStore::sendAnalyticsEventLazy(std::string_view eventName, PayloadB
     const foundation::Dictionary payload = payloadBuilder();
     const foundation::Lock lock(lock_);
     if (SerialQueue::isTurnRunning()) {
-        turn_.events.add(time, eventName, payload);
-        if (isRoomIn(turn_))
+        turn_.add(time, eventName, payload);
+        if (isRoomBeside(turn_, 0))
             return;
-        waiting_.takeFrom(turn_); // a turn that is too large is written in parts
+        waiting_.events.takeFrom(turn_); // a turn that is too large is written in parts
     } else {
         waiting_.events.add(time, eventName, payload);
     }
@@ -85,7 +77,7 @@ void AnalyticsStore::endTurn(WhenKept whenKept)
     {
         const foundation::Lock lock(lock_);
         if (!isEverythingKept()) {
-            waiting_.takeFrom(turn_);
+            waiting_.events.takeFrom(turn_);
             if (whenKept)
                 waiting_.whenKept.push_back(std::move(whenKept));
             wakeWriter();
@@ -104,7 +96,7 @@ void AnalyticsStore::flush()
         const foundation::Lock lock(lock_);
         if (isEverythingKept())
             return;
-        waiting_.takeFrom(turn_);
+        waiting_.events.takeFrom(turn_);
         waiting_.whenKept.emplace_back([&kept] { kept.set_value(); });
         wakeWriter();
     }
@@ -131,7 +123,7 @@ void AnalyticsStore::applyConfiguration()
 
 bool AnalyticsStore::isEverythingKept() const
 {
-    return turn_.empty() && waiting_.empty() && !isWriting_;
+    return turn_.size() == 0 && waiting_.empty() && !isWriting_;
 }
 
 void AnalyticsStore::wakeWriter()
@@ -142,7 +134,7 @@ void AnalyticsStore::wakeWriter()
 
 void AnalyticsStore::waitForRoom()
 {
-    while (!isRoomIn(waiting_))
+    while (!isRoomBeside(waiting_.events, waiting_.whenKept.size()))
         room_.wait(lock_);
 }
 

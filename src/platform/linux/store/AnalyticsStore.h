@@ -80,12 +80,11 @@ private:
         std::vector<WhenKept> whenKept;
 
         [[nodiscard]] bool empty() const noexcept { return events.size() == 0 && whenKept.empty(); }
-        void takeFrom(Batch& other); // which is then empty
         void clear();
     };
 
     void applyConfiguration();
-    [[nodiscard]] bool isRoomIn(const Batch& batch) const noexcept;
+    [[nodiscard]] bool isRoomBeside(const EventBatch& events, std::size_t waiters) const noexcept;
     [[nodiscard]] bool isEverythingKept() const KESTO_REQUIRES(lock_);
     void wakeWriter() KESTO_REQUIRES(lock_);
     void waitForRoom() KESTO_REQUIRES(lock_);
@@ -106,7 +105,7 @@ private:
     foundation::Mutex lock_;
     foundation::Condition changed_; // something waits to be written
     foundation::Condition room_; // what waited is being written
-    Batch turn_ KESTO_GUARDED_BY(lock_); // of the turn that has not ended
+    EventBatch turn_ KESTO_GUARDED_BY(lock_); // of the turn that has not ended
     Batch waiting_ KESTO_GUARDED_BY(lock_);
     std::optional<AnalyticsConfiguration> newConfiguration_ KESTO_GUARDED_BY(lock_);
     bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until those who wait have been told

@@ -319,9 +319,7 @@ EventDatabase::Expected<> EventDatabase::execute(const char* sql)
 {
     if (::sqlite3_exec(connection_.get(), sql, nullptr, nullptr, nullptr) == SQLITE_OK)
         return {};
-    const StoreError error = lastError();
-    rollBack();
-    return std::unexpected(error);
+    return std::unexpected(lastError());
 }
 
 EventDatabase::Expected<std::int64_t> EventDatabase::number(const char* sql)

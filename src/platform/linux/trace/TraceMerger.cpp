@@ -13,13 +13,6 @@ constexpr std::size_t threadOffset = 4;
 constexpr std::size_t markerOffset = 8;
 constexpr std::size_t recordSize = markerOffset + sizeof(TraceMarkerRecord);
 
-template <typename Number> Number numberAt(std::span<const std::byte> bytes, std::size_t offset)
-{
-    Number number{};
-    std::memcpy(&number, bytes.data() + offset, sizeof number);
-    return number;
-}
-
 bool isBefore(const TracedMarker& left, const TracedMarker& right)
 {
     return left.timestamp < right.timestamp;
@@ -29,8 +22,8 @@ bool isBefore(const TracedMarker& left, const TracedMarker& right)
 
 bool TraceMerger::isMarker(std::span<const std::byte> record) const noexcept
 {
-    return record.size() == recordSize && numberAt<std::uint16_t>(record, 0) == recordType_
-        && numberAt<std::uint32_t>(record, markerOffset) == TraceMarkerRecord::ownTag;
+    return record.size() == recordSize && fieldAt<std::uint16_t>(record, 0) == recordType_
+        && fieldAt<std::uint32_t>(record, markerOffset) == TraceMarkerRecord::ownTag;
 }
 
 void TraceMerger::take(std::uint32_t cpu, std::span<const std::byte> page)
@@ -56,9 +49,9 @@ void TraceMerger::add(std::vector<TracedMarker>& stream, std::uint32_t cpu, cons
     ++waiting_;
     TracedMarker& event = stream.emplace_back();
     event.timestamp = record.timestamp;
-    event.threadID = numberAt<std::uint32_t>(record.bytes, threadOffset);
+    event.threadID = fieldAt<std::uint32_t>(record.bytes, threadOffset);
     event.cpu = cpu;
-    event.record = numberAt<TraceMarkerRecord>(record.bytes, markerOffset);
+    event.record = fieldAt<TraceMarkerRecord>(record.bytes, markerOffset);
 }
 
 std::span<const TracedMarker> TraceMerger::eventsUpTo(std::uint64_t time)

@@ -13,13 +13,8 @@ constexpr std::uint32_t areMissed = 1U << 31;
 // A number of 4 or 8 bytes.
 std::uint64_t numberAt(std::span<const std::byte> bytes, std::size_t offset, std::size_t size)
 {
-    std::uint64_t number = 0;
-    std::uint32_t half = 0;
-    if (size == sizeof number)
-        std::memcpy(&number, bytes.data() + offset, sizeof number);
-    else
-        std::memcpy(&half, bytes.data() + offset, sizeof half);
-    return size == sizeof number ? number : half;
+    return size == sizeof(std::uint64_t) ? fieldAt<std::uint64_t>(bytes, offset)
+                                         : fieldAt<std::uint32_t>(bytes, offset);
 }
 
 } // namespace
@@ -30,7 +25,7 @@ TracePageReader::TracePageReader(std::span<const std::byte> page, const TracePag
         isBroken_ = true;
         return;
     }
-    time_ = numberAt(page, 0, sizeof time_);
+    time_ = fieldAt<std::uint64_t>(page, 0);
     const std::uint64_t commit = numberAt(page, TracePageFormat::commitOffset, format.commitSize);
     const std::span<const std::byte> data = page.subspan(format.dataOffset);
     const std::size_t size = commit & committedBytes;

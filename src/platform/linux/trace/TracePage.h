@@ -22,6 +22,14 @@ struct TracePageFormat {
     std::size_t dataOffset = 16;
 };
 
+// What stands at that place, which the bytes must hold, in the processor's own form.
+template <typename Field> Field fieldAt(std::span<const std::byte> bytes, std::size_t offset) noexcept
+{
+    Field field{};
+    std::memcpy(&field, bytes.data() + offset, sizeof field);
+    return field;
+}
+
 struct TraceRecord {
     std::uint64_t timestamp = 0; // of the trace's clock
     std::span<const std::byte> bytes; // from the record's type on; valid as long as the page
@@ -49,9 +57,7 @@ private:
 
     [[nodiscard]] std::uint32_t word(std::size_t index) const noexcept
     {
-        std::uint32_t value = 0;
-        std::memcpy(&value, rest_.data() + index * wordSize, sizeof value);
-        return value;
+        return fieldAt<std::uint32_t>(rest_, index * wordSize);
     }
     [[nodiscard]] bool holds(std::size_t words) noexcept
     {

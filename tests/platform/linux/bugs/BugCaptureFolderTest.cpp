@@ -237,6 +237,15 @@ TEST_F(BugCaptureFolderTest, LeavesNothingOfACaptureThatDoesNotFit)
     EXPECT_THAT(namesIn(captures), ElementsAre(capture(1).filename())) << "the small one, of the same number";
 }
 
+TEST_F(BugCaptureFolderTest, LeavesNothingOfACaptureWhosePlaceIsTaken)
+{
+    BugCaptureFolder folder(state);
+    fs::create_directories(capture(1) / "of a person");
+    EXPECT_EQ(folder.add(capture(1).filename(), {{"signature.json", "{}"}}, {}), std::errc::directory_not_empty);
+    EXPECT_THAT(namesIn(captures), ElementsAre(capture(1).filename()));
+    EXPECT_THAT(namesIn(capture(1)), ElementsAre("of a person"));
+}
+
 TEST_F(BugCaptureFolderTest, KilledAtAnyMomentEveryCaptureThatIsSeenIsWhole)
 {
     constexpr int kills = 10;

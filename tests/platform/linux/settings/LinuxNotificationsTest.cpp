@@ -111,6 +111,17 @@ TEST_F(LinuxNotificationsTest, PostsANameWhoseFileIsTouchedWithoutBeingOpened)
     EXPECT_EQ(posts.tokens().size(), 1U);
 }
 
+TEST_F(LinuxNotificationsTest, PostsNothingWhenTheDirectoryItselfIsTouched)
+{
+    write(ringer, "1");
+    settle();
+    Posts posts;
+    (void)registerName(ringer, posts);
+    ASSERT_EQ(::utimensat(AT_FDCWD, directory_.c_str(), nullptr, 0), 0);
+    settle();
+    EXPECT_TRUE(posts.tokens().empty());
+}
+
 TEST_F(LinuxNotificationsTest, PostsNothingWhenOtherDirectoriesComeAndGo)
 {
     const auto watch = watcher_.watch("preferences", [](std::string_view) { });
@@ -163,8 +174,10 @@ TEST_F(LinuxNotificationsTest, HasNoStateWithoutAFileOrWithGarbageInIt)
         write(ringer, garbage);
         EXPECT_FALSE(notifications_.state(token)) << garbage;
     }
-    write(ringer, std::string(1000, '1'));
-    EXPECT_FALSE(notifications_.state(token));
+    write(ringer, "7" + std::string(63, ' '));
+    EXPECT_EQ(notifications_.state(token), 7U);
+    write(ringer, "7" + std::string(64, ' '));
+    EXPECT_FALSE(notifications_.state(token)) << "longer than a state may be";
     write(ringer, " 18446744073709551615\r\n");
     EXPECT_EQ(notifications_.state(token), 18446744073709551615U);
 }
@@ -186,6 +199,7 @@ TEST_F(LinuxNotificationsTest, RefusesNamesThatCouldLeaveTheDirectory)
     for (const std::string_view name : {"", ".", "..", "../x", "a/b", ".hidden"})
         EXPECT_EQ(registerName(name, posts).status, LinuxNotifications::invalidName) << name;
     EXPECT_EQ(registerName(std::string(256, 'a'), posts).status, LinuxNotifications::invalidName);
+    EXPECT_EQ(registerName(std::string(255, 'a'), posts).status, 0U);
     EXPECT_EQ(notifications_.state(0).error(), LinuxNotifications::unknownToken);
     EXPECT_EQ(notifications_.state(99).error(), LinuxNotifications::unknownToken);
 }

@@ -286,6 +286,19 @@ TEST_F(LinuxPreferencesTest, DomainsBeyondThoseKeptAreStillRead)
     EXPECT_EQ(preferences->value("one.more", "key"), Value(2));
 }
 
+TEST_F(LinuxPreferencesTest, TellsNothingOfDomainsBeyondThoseKept)
+{
+    fs::create_directories(folder);
+    for (int number = 0; number < 64; ++number)
+        support::writeFile(folder / ("domain" + std::to_string(number) + ".toml"), "key = 1");
+    makePreferencesThatTell();
+    support::writeFile(folder / "one.more.toml", "key = 1");
+    support::writeFile(folder / "domain63.toml", "key = 2");
+    EXPECT_EQ(changes.next(), "domain63");
+    EXPECT_TRUE(changes.none());
+    EXPECT_EQ(preferences->value("one.more", "key"), Value(1)) << "but they are read";
+}
+
 // --- The watcher
 
 TEST_F(LinuxPreferencesTest, NoThreadIsStartedBeforeSomebodyWatches)

@@ -77,6 +77,10 @@ TEST(TracePages, SetTheTimeAndKeepItsHighestBits)
     TracePageBuilder builder(high + 1000);
     builder.stamp(7'000'000'000).record(7'000'000'005, "now.");
     EXPECT_THAT(read(builder.page()).records, ElementsAre(Pair(high + 7'000'000'005, "now.")));
+    const std::uint64_t lowest = high + (std::uint64_t{1} << 59);
+    EXPECT_THAT(read(TracePageBuilder(lowest - 1).stamp(0).record(1, "now.").page()).records,
+                ElementsAre(Pair(high + 1, "now.")))
+        << "every bit below the highest is set";
 }
 
 TEST(TracePages, SkipWhatWasTakenBackButNotItsTime)

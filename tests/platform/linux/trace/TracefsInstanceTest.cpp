@@ -189,6 +189,25 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenPagesWouldHoldNothingButTheirHead)
             << offset;
 }
 
+TEST_F(TracefsInstanceTest, HasPagesOfKernelsWith32Or64Bits)
+{
+    const fs::path path = tree.instance / "events/header_page";
+    const std::string right = readFile(path);
+    const std::string commit = "commit;\toffset:8;\tsize:";
+    const auto setCommitSize = [&](const std::string& size) {
+        std::string changed = right;
+        writeFile(path, changed.replace(right.find(commit), commit.size() + 1, commit + size));
+    };
+    for (const char* size : {"3", "5", "7", "9"}) {
+        setCommitSize(size);
+        EXPECT_THAT(problem(), EndsWith("events/header_page is not as this service knows it")) << size;
+    }
+    setCommitSize("4");
+    const auto instance = open();
+    ASSERT_TRUE(instance) << instance.error().what;
+    EXPECT_EQ(instance->pageFormat().commitSize, 4U);
+}
+
 TEST_F(TracefsInstanceTest, LooksOnlyAtProcessors)
 {
     for (const char* name : {"cpu", "cpux", "cpu-1", "cpu99999999999", "other"})

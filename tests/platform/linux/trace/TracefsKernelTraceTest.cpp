@@ -14,6 +14,7 @@
 #include <gmock/gmock.h>
 #include <map>
 #include <mutex>
+#include <sys/file.h>
 #include <sys/mman.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
@@ -302,6 +303,33 @@ TEST_F(TracefsKernelTraceTest, TracesAlsoWhenClientsCannotEmitAndSaysSo)
     EXPECT_NE(session, nullptr);
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(LogLevel::Error, "kerl", "clients cannot emit trace events: File too large")));
+}
+
+TEST_F(TracefsKernelTraceTest, HasTheFirstInstanceThatNoneOfSevenOtherServicesHas)
+{
+    const fs::path folder = tree.instance.parent_path();
+    std::vector<FileDescriptor> others;
+    const auto takeByAnother = [&](const std::string& name) {
+        fs::create_directories(folder / name);
+        others.emplace_back(::open((folder / name).c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+        EXPECT_EQ(::flock(others.back().get(), LOCK_EX | LOCK_NB), 0);
+    };
+    takeByAnother("kesto");
+    for (const char* next : {"kesto-2", "kesto-3", "kesto-4", "kesto-5", "kesto-6", "kesto-7", "kesto-8"}) {
+        EXPECT_FALSE(trace.isAvailable());
+        EXPECT_THAT(log.take(),
+                    ElementsAre(IsLine(LogLevel::Error, "kerl",
+                                       "there is no kernel trace: " + (folder / next).string()
+                                           + "/tracing_on cannot be written: No such file or directory")))
+            << "it is made, but has no files in this tree";
+        takeByAnother(next);
+    }
+    EXPECT_FALSE(trace.isAvailable());
+    EXPECT_THAT(log.take(),
+                ElementsAre(IsLine(LogLevel::Error, "kerl",
+                                   "there is no kernel trace: " + (folder / "kesto-8").string()
+                                       + " belongs to another service that runs")));
+    EXPECT_FALSE(fs::exists(folder / "kesto-9"));
 }
 
 TEST_F(TracefsKernelTraceTest, SaysWhatIsForbidden)
