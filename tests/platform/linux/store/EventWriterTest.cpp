@@ -2,6 +2,7 @@
 // its bounds: events may be lost, and are counted; the service never is.
 #include "platform/linux/store/EventWriter.h"
 
+#include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/store/ManualClock.h"
 #include "platform/linux/store/StoreReader.h"
 #include "support/TemporaryDirectory.h"
@@ -10,6 +11,7 @@
 #include <cerrno>
 #include <csignal>
 #include <cstring>
+#include <fcntl.h>
 #include <fmt/format.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -504,6 +506,25 @@ TEST_F(EventWriterTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
     int status = 0;
     ASSERT_EQ(::waitpid(child, &status, 0), child);
     EXPECT_EQ(status, 0);
+}
+
+TEST_F(EventWriterTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
+{
+    keep({event(1, "a")});
+    // Behind SQLite's back, what it writes to becomes a file that nothing can be written to.
+    const FileDescriptor unwritable(::open("/dev/null", O_RDONLY | O_CLOEXEC));
+    for (const auto& open : fs::directory_iterator("/proc/self/fd"))
+        if (std::error_code gone; fs::read_symlink(open, gone) == file().string() + "-wal") {
+            ASSERT_GE(::dup2(unwritable.get(), std::stoi(open.path().filename())), 0);
+        }
+    keep({event(2, "b")});
+    EXPECT_EQ(lost(StoreError::InputOutput), 1U);
+    EXPECT_THAT(log.take(),
+                ElementsAre(support::IsLine(LogLevel::Error, "kerl",
+                                            "1 analytics events were lost (1 since the start): " + file().string()
+                                                + ": the disk failed; look for its errors in the kernel's log")));
+    keep({event(3, "c")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("a", "c"));
 }
 
 TEST_F(EventWriterTest, LossesAreToldAtOnceAndThenOnceAMinute)

@@ -174,7 +174,7 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenTheKernelsFormatsAreOthers)
     EXPECT_EQ(problem(), "");
 }
 
-TEST_F(TracefsInstanceTest, IsNotUsedWhenPagesWouldHoldNothingButTheirHead)
+TEST_F(TracefsInstanceTest, IsNotUsedWhenPagesWouldHoldLessThanTheirHeadOrNothingElse)
 {
     const fs::path path = tree.instance / "events/header_page";
     const std::string right = readFile(path);
@@ -184,7 +184,8 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenPagesWouldHoldNothingButTheirHead)
         return problem();
     };
     EXPECT_EQ(problemWithOffset("4095"), "");
-    for (const char* offset : {"4096", "5000", "9223372036854775807"})
+    EXPECT_EQ(problemWithOffset("16"), "");
+    for (const char* offset : {"0", "15", "4096", "5000", "9223372036854775807"})
         EXPECT_THAT(problemWithOffset(offset), EndsWith("events/header_page is not as this service knows it"))
             << offset;
 }
