@@ -160,9 +160,14 @@ TEST_F(ConnectionTest, ThatIsClosedHasItsClientLeaveBeforeAnythingElseIsDone)
 
 TEST_F(ConnectionTest, OfNoTimeIsStillADouble)
 {
-    connect()->close();
+    const auto connection = connect();
+    connection->close();
     ASSERT_THAT(uptimes(), ElementsAre(Number(0.0)));
     EXPECT_EQ(uptimes()[0].kind(), Number::Kind::Float64);
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Default, "kers",
+                                   "invalidationHandler: connection exited process=player uptime_sec=0")))
+        << "it began no later than now";
 }
 
 TEST_F(ConnectionTest, TellsItsTimeWithoutBuildingThePayload)
