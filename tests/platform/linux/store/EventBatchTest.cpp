@@ -43,6 +43,16 @@ TEST(EventBatchTest, IsEmptyAtFirstAndWhenCleared)
     EXPECT_THAT(batch.rows(), IsEmpty());
 }
 
+TEST(EventBatchTest, EachEventCountsBesideItsPayload)
+{
+    const Dictionary shared{{"n", 1}};
+    EventBatch batch;
+    for (int number = 0; number < 1000; ++number)
+        batch.add(1, "name", shared);
+    EXPECT_GE(batch.bytes(), 20'000U);
+    EXPECT_LE(batch.bytes(), 60'000U);
+}
+
 TEST(EventBatchTest, EventsComeInTheirOrder)
 {
     EventBatch batch;
