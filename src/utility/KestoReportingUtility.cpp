@@ -237,7 +237,7 @@ std::optional<std::string> KestoReportingUtilityBucketNumberToString(double numb
     }
     if (!chosen)
         return std::nullopt;
-    return foundation::formatDecimal(*chosen, places == 0 ? 0 : 1, places);
+    return foundation::formatDecimal(*chosen, 1, places);
 }
 
 std::int64_t KestoReportingUtilityExtractSessionIDFromReporterID(std::int64_t reporterID)

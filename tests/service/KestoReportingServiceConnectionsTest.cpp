@@ -164,9 +164,9 @@ TEST_F(ConnectionTest, OfNoTimeIsStillADouble)
     connection->close();
     ASSERT_THAT(uptimes(), ElementsAre(Number(0.0)));
     EXPECT_EQ(uptimes()[0].kind(), Number::Kind::Float64);
-    EXPECT_THAT(platform.log.lines(),
-                ElementsAre(IsLine(Default, "kers",
-                                   "invalidationHandler: connection exited process=player uptime_sec=0")))
+    EXPECT_THAT(
+        platform.log.lines(),
+        ElementsAre(IsLine(Default, "kers", "invalidationHandler: connection exited process=player uptime_sec=0")))
         << "it began no later than now";
 }
 

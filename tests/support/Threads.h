@@ -1,12 +1,18 @@
-// How many threads the process has, told without surprise by those that a sanitizer keeps for itself.
+// The threads of the process: how many there are, told without surprise by those that a sanitizer keeps for itself, and
+// how nice one of them is.
 #pragma once
 
 #include "support/Sanitizers.h"
 
+#include <chrono>
 #include <cstddef>
 #include <filesystem>
+#include <fstream>
 #include <iterator>
+#include <optional>
 #include <string>
+#include <string_view>
+#include <sys/resource.h>
 #include <thread>
 #include <unistd.h>
 
@@ -27,6 +33,21 @@ inline std::size_t threadsOfTheProcess()
         bringForthTheSanitizersThread();
     return static_cast<std::size_t>(
         std::distance(std::filesystem::directory_iterator("/proc/self/task"), std::filesystem::directory_iterator()));
+}
+
+// The nice value of the thread of that name, beyond the calling one's; nothing when no such thread comes.
+inline std::optional<int> nicenessBeyondOwn(std::string_view name)
+{
+    const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    while (std::chrono::steady_clock::now() < deadline)
+        for (const auto& thread : std::filesystem::directory_iterator("/proc/self/task")) {
+            std::string found;
+            std::ifstream comm(thread.path() / "comm");
+            if (std::getline(comm, found) && found == name)
+                return ::getpriority(PRIO_PROCESS, static_cast<id_t>(std::stoi(thread.path().filename())))
+                    - ::getpriority(PRIO_PROCESS, 0);
+        }
+    return std::nullopt;
 }
 
 } // namespace support

@@ -31,6 +31,7 @@ TEST(NumberFormatter, DropsTrailingZerosDownToTheMinimum)
     EXPECT_EQ(formatDecimal(3, 0, 2), "3");
     EXPECT_EQ(formatDecimal(10, 0, 2), "10");
     EXPECT_EQ(formatDecimal(100, 0, 0), "100");
+    EXPECT_EQ(formatDecimal(100, 1, 0), "100");
     EXPECT_EQ(formatDecimal(0.001, 1, 2), "0.0");
 }
 

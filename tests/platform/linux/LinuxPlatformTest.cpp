@@ -3,6 +3,7 @@
 
 #include "platform/linux/store/StoreReader.h"
 #include "support/TemporaryDirectory.h"
+#include "support/Threads.h"
 
 #include <future>
 #include <gtest/gtest.h>
@@ -68,6 +69,13 @@ TEST_F(LinuxPlatformTest, PreferencesThatChangePostTheNotificationOfTheirDomain)
         support::replaceFile(make("etc") / "preferences" / (std::string(domain) + ".toml"), "key = 1");
         EXPECT_EQ(posted->get_future().wait_for(std::chrono::seconds(20)), std::future_status::ready) << domain;
     }
+}
+
+TEST_F(LinuxPlatformTest, ItsThreadsAreNoNicerThanTheProcess)
+{
+    const LinuxPlatform providers(launch());
+    EXPECT_EQ(support::nicenessBeyondOwn("analytics"), 0);
+    EXPECT_EQ(support::nicenessBeyondOwn("configuration"), 0);
 }
 
 TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)

@@ -45,8 +45,8 @@ std::string threadName(std::string_view name)
 std::thread startThread(std::string_view name, QualityOfService quality, WorkItem body)
 {
     return std::thread([name = threadName(name), quality, body = std::move(body)]() mutable {
-        pthread_setname_np(pthread_self(), name.c_str());
         setQualityOfThisThread(quality);
+        pthread_setname_np(pthread_self(), name.c_str()); // last: who sees the name sees the priority
         body();
     });
 }

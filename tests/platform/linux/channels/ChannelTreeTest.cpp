@@ -289,6 +289,26 @@ TEST_F(ChannelTreeTest, TakesSoManyBytesAndCountsTheRest)
     EXPECT_EQ(read().leftOut.beyondChannels, 0U);
 }
 
+TEST_F(ChannelTreeTest, TakesTheFileInWhichTheBytesEnd)
+{
+    const std::string text = "simple\n1\n";
+    publish("amp/Tx/-/a", text);
+    publish("amp/Tx/-/b", text);
+    EXPECT_TRUE(ChannelTree(root, {.bytes = text.size() + 1}).read({})->leftOut.isNothing());
+    EXPECT_EQ(ChannelTree(root, {.bytes = text.size()}).read({})->leftOut.beyondBytes, 1U);
+}
+
+TEST_F(ChannelTreeTest, SaysWhatIsLeftOutFromTheFirstOn)
+{
+    EXPECT_THAT((LeftOutChannels{.beyondChannels = 1, .beyondBytes = 1, .beyondNames = 1}.inWords(
+                    {.channels = 10, .bytes = 20, .names = 30})),
+                ElementsAre("channels left out of a sample: 1, beyond the 10 that it takes",
+                            "channels left out of a sample: 1, beyond the 20 bytes of files that it takes",
+                            "folders left out of a sample, in part or whole: at least 1, beyond the 30 names that it "
+                            "looks at"));
+    EXPECT_THAT(LeftOutChannels().inWords({}), IsEmpty());
+}
+
 TEST_F(ChannelTreeTest, LooksAtSoManyNamesInAllFoldersAndNoMore)
 {
     for (const char* name : {".1", ".2", ".3"})

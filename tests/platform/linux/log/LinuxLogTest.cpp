@@ -89,8 +89,8 @@ TEST_F(LinuxLogDescriptorTest, AClientCannotSteerTheTerminal)
 
 TEST_F(LinuxLogDescriptorTest, KeepsTextBeyondAsciiAsItIs)
 {
-    log().write(record("Größe 音量 \xf0\x9f\x8e\xb5"));
-    EXPECT_EQ(nextWrite(), std::string(prefix) + "Größe 音量 \xf0\x9f\x8e\xb5\n");
+    log().write(record("Größe in µs 音量 \xf0\x9f\x8e\xb5"));
+    EXPECT_EQ(nextWrite(), std::string(prefix) + "Größe in µs 音量 \xf0\x9f\x8e\xb5\n");
 }
 
 TEST_F(LinuxLogDescriptorTest, AnEmptyMessageIsALineToo)

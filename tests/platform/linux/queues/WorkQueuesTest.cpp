@@ -359,6 +359,7 @@ TEST_F(WorkQueuesTest, ThreadsHaveTheLastWordsOfTheirQueuesName)
     EXPECT_EQ(threadName("Tracing Queue"), "Tracing Queue");
     EXPECT_EQ(threadName("com.quarn.kesto.reporting.server"), "server");
     EXPECT_EQ(threadName("com.short"), "com.short");
+    EXPECT_EQ(threadName("com.fifteen.abc"), "com.fifteen.abc");
     EXPECT_EQ(threadName("a-name-without-any-dot"), "a-name-without-");
 
     const auto queue = makeQueue();
@@ -391,6 +392,12 @@ TEST_F(WorkQueuesTest, PrioritiesFollowTheQualityOfServiceAsFarAsTheProcessMay)
     EXPECT_TRUE(interactive == ofTheProcess - 10 || interactive == ofTheProcess) << interactive;
     EXPECT_EQ(ordinary, ofTheProcess);
     EXPECT_EQ(background, std::min(ofTheProcess + 10, 19));
+}
+
+TEST_F(WorkQueuesTest, WhatDelaysWorkIsNoNicerThanTheProcess)
+{
+    queues.submitAfter(1h, queues.backgroundQueue(), [] { });
+    EXPECT_EQ(support::nicenessBeyondOwn("delayed work"), 0);
 }
 
 TEST_F(WorkQueuesTest, AHelperHasThePriorityOfTheQueuesThatItHelpsAsLongAsItDoes)

@@ -549,6 +549,12 @@ TEST_F(EventWriterTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("a", "c"));
 }
 
+TEST_F(EventWriterTest, WithoutADatabaseNothingIsLeftToTidy)
+{
+    EXPECT_FALSE(writer().maintain(true));
+    EXPECT_FALSE(writer().awaitsQuiet());
+}
+
 TEST_F(EventWriterTest, LossesAreToldAtOnceAndThenOnceAMinute)
 {
     const Dictionary bad{{"n", std::numeric_limits<double>::quiet_NaN()}};

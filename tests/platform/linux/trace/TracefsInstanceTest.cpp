@@ -209,6 +209,16 @@ TEST_F(TracefsInstanceTest, HasPagesOfKernelsWith32Or64Bits)
     EXPECT_EQ(instance->pageFormat().commitSize, 4U);
 }
 
+TEST_F(TracefsInstanceTest, MayHaveAnyTypeOfRecordThatARecordCanHold)
+{
+    const fs::path path = tree.instance / "events/ftrace/raw_data/format";
+    std::string changed = readFile(path);
+    writeFile(path, changed.replace(changed.find("ID: 19"), 6, "ID: 65535"));
+    const auto instance = open();
+    ASSERT_TRUE(instance) << instance.error().what;
+    EXPECT_EQ(instance->markerType(), 65535U);
+}
+
 TEST_F(TracefsInstanceTest, LooksOnlyAtProcessors)
 {
     for (const char* name : {"cpu", "cpux", "cpu-1", "cpu99999999999", "other"})

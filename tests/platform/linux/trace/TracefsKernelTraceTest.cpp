@@ -4,6 +4,7 @@
 #include "platform/linux/queues/SerialQueue.h"
 #include "platform/linux/trace/RealTracefs.h"
 #include "platform/linux/trace/TracePages.h"
+#include "support/Threads.h"
 #include "support/fakes/FakeLog.h"
 
 #include <algorithm>
@@ -173,6 +174,17 @@ TEST_F(TracefsKernelTraceTest, IsOnWhileASessionRunsAndOffOtherwise)
     again.session.reset();
     EXPECT_TRUE(waitUntilOff()) << "a session that goes without an end is over, too";
     EXPECT_THAT(log.lines(), IsEmpty());
+}
+
+TEST_F(TracefsKernelTraceTest, ReadsWithThePriorityOfWhatSomebodyWaitsFor)
+{
+    const int own = ::getpriority(PRIO_PROCESS, 0);
+    if (::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), own - 1) != 0)
+        GTEST_SKIP() << "this process may not raise priorities";
+    ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), own);
+    Listener listener(trace);
+    ASSERT_EQ(listener.start(), 0);
+    EXPECT_EQ(support::nicenessBeyondOwn("kesto.trace"), -10);
 }
 
 TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
