@@ -11,6 +11,7 @@ void measurePipeline(const Options& options, Report& report);
 void measureStored(const Options& options, Report& report);
 void measureSession(const Options& options, Report& report);
 void measureSessionEnd(const Options& options, Report& report);
+void measureEndedSessions(const Options& options, Report& report);
 void measureLongStop(const Options& options, Report& report);
 void measureLookup(const Options& options, Report& report);
 void measureNotification(const Options& options, Report& report);

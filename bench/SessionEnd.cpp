@@ -91,6 +91,43 @@ void measureAnalysis(const Options& options, Report& report)
                 Target::figureAtMost(200)});
 }
 
+// In bytes.
+std::size_t allocated()
+{
+    const auto info = ::mallinfo2();
+    return info.uordblks + info.hblkhd;
+}
+
+// Of a session in which nothing but the volume changes: each message ends a stretch.
+void measureVolumeEvents(const Options& options, Report& report)
+{
+    constexpr int changeCount = 200'000;
+    KestoReportingMessageStore store(KestoReportingStorageBudget::service());
+    for (int change = 0; change <= changeCount; ++change)
+        use(store.record(sampleCategory, sampleType,
+                         {{"session_output_running", true},
+                          {"PomoSessionVolume", change % 2},
+                          {"kestoreporting_timestamp", change}}));
+    const std::optional<foundation::Value> process("player");
+    std::vector<double> perSecond;
+    std::vector<double> bytes;
+    std::vector<double> paidBytes;
+    for (int round = 0; round < options.rounds; ++round) {
+        ::malloc_trim(0);
+        KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+        const std::size_t before = allocated();
+        const auto start = Clock::now();
+        const auto events = KestoReportingSession::createVolumeMessages(store, process, 0.5, share);
+        const auto count = static_cast<double>(events.size());
+        perSecond.push_back(count * 1e9 / nanosecondsSince(start));
+        bytes.push_back(static_cast<double>(allocated() - before) / count);
+        paidBytes.push_back(static_cast<double>(share.bytes()) / count);
+    }
+    report.add({"volume events made a second", "", perSecond});
+    report.add(
+        {"memory of a volume event", "B", bytes, Peer{"what is paid for it", paidBytes}, Target::ratioAtMost(1)});
+}
+
 // The values, handed to RapidJSON's writer.
 template <typename Writer> void writeWithRapidJson(const foundation::Value& value, Writer& writer)
 {
@@ -196,6 +233,7 @@ void measureSessionEnd(const Options& options, Report& report)
     const InProcessPlatform platform(&files);
     measureMemory(options, report);
     measureAnalysis(options, report);
+    measureVolumeEvents(options, report);
     const auto session = makeLongSession();
     measureFile(options, report, *session, directory.path());
     measureEvent(options, report, *session);

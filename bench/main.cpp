@@ -26,6 +26,7 @@ constexpr std::array groups{
     Group{"stored", "messages a second that become stored events", measureStored},
     Group{"session", "recording a million messages: time and memory", measureSession},
     Group{"end", "the end of a session of a million messages", measureSessionEnd},
+    Group{"ended", "the memory that stays of sessions that ended", measureEndedSessions},
     Group{"starving", "what others wait while a long session ends", measureLongStop},
     Group{"lookup", "finding a session among 10,000 clients", measureLookup},
     Group{"notification", "telling all sessions that a setting changed", measureNotification},

@@ -32,7 +32,8 @@ public:
                            .bugCapture = bugCapture_,
                            .kernelTrace = kernelTrace_,
                            .performanceWriter = performanceWriter_,
-                           .fileSystem = filesOfInternalBuild != nullptr ? *filesOfInternalBuild : fileSystem_});
+                           .fileSystem = filesOfInternalBuild != nullptr ? *filesOfInternalBuild : fileSystem_,
+                           .memory = memory_});
     }
     ~InProcessPlatform() { platform::uninstall(); }
     InProcessPlatform(const InProcessPlatform&) = delete;
@@ -156,6 +157,7 @@ private:
     platform::AbsentKernelTrace kernelTrace_;
     platform::AbsentPerformanceWriter performanceWriter_;
     FileSystem fileSystem_;
+    platform::AbsentMemory memory_;
 };
 
 } // namespace bench

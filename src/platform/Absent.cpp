@@ -9,6 +9,8 @@ namespace platform {
 
 void AbsentTraceMarkers::emit(std::uint32_t, const std::array<std::uint64_t, 4>&) { }
 
+void AbsentMemory::letGo(std::size_t) { }
+
 ReportingChannels::FoundChannels AbsentReportingChannels::copyChannelsInGroup(std::optional<std::string_view>,
                                                                               std::optional<std::string_view>)
 {

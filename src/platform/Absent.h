@@ -4,6 +4,7 @@
 
 #include "platform/BugCapture.h"
 #include "platform/KernelTrace.h"
+#include "platform/Memory.h"
 #include "platform/PerformanceWriter.h"
 #include "platform/ReportingChannels.h"
 #include "platform/TraceMarkers.h"
@@ -36,6 +37,12 @@ private:
 class AbsentBugCapture final : public BugCapture {
 public:
     [[nodiscard]] std::unique_ptr<BugCaptureReporter> makeReporter() override;
+};
+
+// Nothing can be done about the memory that is let go.
+class AbsentMemory final : public Memory {
+public:
+    void letGo(std::size_t bytes) override;
 };
 
 // There is no kernel trace: no session can be made.

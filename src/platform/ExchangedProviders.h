@@ -38,7 +38,8 @@ template <typename... Providers> [[nodiscard]] Platform withExchanged(const Plat
                           .bugCapture = pick(platform.bugCapture),
                           .kernelTrace = pick(platform.kernelTrace),
                           .performanceWriter = pick(platform.performanceWriter),
-                          .fileSystem = pick(platform.fileSystem)};
+                          .fileSystem = pick(platform.fileSystem),
+                          .memory = pick(platform.memory)};
     assert(matches == sizeof...(exchanged) && "one of them has no interface of a provider");
     return result;
 }

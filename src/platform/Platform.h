@@ -12,6 +12,7 @@
 #include "platform/FileSystem.h"
 #include "platform/KernelTrace.h"
 #include "platform/Log.h"
+#include "platform/Memory.h"
 #include "platform/Notifications.h"
 #include "platform/PerformanceWriter.h"
 #include "platform/Preferences.h"
@@ -39,6 +40,7 @@ struct Platform {
     KernelTrace& kernelTrace;
     PerformanceWriter& performanceWriter;
     FileSystem& fileSystem;
+    Memory& memory;
 };
 
 // Makes the platform current. While it is being changed nothing else may use it.

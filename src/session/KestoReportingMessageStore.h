@@ -69,6 +69,8 @@ public:
 
     [[nodiscard]] std::size_t size() const noexcept { return size_; }
     [[nodiscard]] bool empty() const noexcept { return size_ == 0; }
+    // What it has paid for.
+    [[nodiscard]] std::size_t bytes() const noexcept { return share_.bytes(); }
 
     // Goes over the messages in the order of acceptance; a copy goes on by itself from the same place. Valid as long
     // as the store records nothing.

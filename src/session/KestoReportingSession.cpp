@@ -56,6 +56,7 @@ KestoReportingSession::~KestoReportingSession()
 {
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionDestroyed);
     KESTO_LOG(KestoReportingSessionCategory(), Info, "deallocing this session {}", reporterID_);
+    letGoOfMessages();
 }
 
 std::string KestoReportingSession::description() const
@@ -151,11 +152,18 @@ void KestoReportingSession::stop()
     if (messagesLost_ != 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for want of memory", reporterID_,
                   messagesLost_);
-    {
-        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        nestedAggregatedPayloadData_.reset();
-    }
+    letGoOfMessages();
     started_ = false;
+}
+
+void KestoReportingSession::letGoOfMessages()
+{
+    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+    if (!nestedAggregatedPayloadData_)
+        return;
+    const std::size_t bytes = nestedAggregatedPayloadData_->bytes();
+    nestedAggregatedPayloadData_.reset();
+    platform::current().memory.letGo(bytes);
 }
 
 // To be read without its lock, which would keep recorders waiting for a disk: whoever stops the session is the one who

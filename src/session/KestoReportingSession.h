@@ -155,6 +155,7 @@ private:
     [[nodiscard]] std::string summaryFileName() const;
     void sendVolumeEvents();
     void sendSummaryEvent();
+    void letGoOfMessages();
     void startTracing();
     void stopTracing();
 

@@ -1,5 +1,5 @@
-// The program's own operator new counts what malloc really gave, a count a thread, so that other threads do not
-// disturb it.
+// The linker has the program call these in place of malloc and its like: they count what those really gave, a count a
+// thread, so that other threads do not disturb it. Operator new is the program's own, so that it is counted as well.
 #include "session/AllocatedBytes.h"
 
 #include <algorithm>
@@ -11,6 +11,17 @@ namespace {
 
 thread_local std::ptrdiff_t bytes = 0;
 thread_local std::ptrdiff_t mostBytes = 0;
+
+void count(std::ptrdiff_t more) noexcept
+{
+    bytes += more;
+    mostBytes = std::max(mostBytes, bytes);
+}
+
+std::ptrdiff_t bytesOf(void* memory) noexcept
+{
+    return static_cast<std::ptrdiff_t>(::malloc_usable_size(memory)); // of null pointer 0
+}
 
 } // namespace
 
@@ -29,24 +40,51 @@ std::ptrdiff_t mostAllocatedBytes() noexcept
     return mostBytes;
 }
 
+// NOLINTBEGIN(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp): the names that the linker gives them
+extern "C" {
+
+void* __real_malloc(std::size_t size);
+void* __real_realloc(void* memory, std::size_t size);
+void __real_free(void* memory);
+
+void* __wrap_malloc(std::size_t size)
+{
+    void* memory = __real_malloc(size);
+    count(bytesOf(memory));
+    return memory;
+}
+
+void* __wrap_realloc(void* memory, std::size_t size)
+{
+    const std::ptrdiff_t before = bytesOf(memory);
+    void* moved = __real_realloc(memory, size);
+    if (moved != nullptr)
+        count(bytesOf(moved) - before);
+    return moved;
+}
+
+void __wrap_free(void* memory)
+{
+    count(-bytesOf(memory));
+    __real_free(memory);
+}
+}
+// NOLINTEND(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp)
+
 void* operator new(std::size_t size)
 {
     void* memory = std::malloc(size);
     if (memory == nullptr)
         throw std::bad_alloc();
-    bytes += static_cast<std::ptrdiff_t>(::malloc_usable_size(memory));
-    mostBytes = std::max(mostBytes, bytes);
     return memory;
 }
 
 void operator delete(void* memory) noexcept
 {
-    if (memory != nullptr)
-        bytes -= static_cast<std::ptrdiff_t>(::malloc_usable_size(memory));
     std::free(memory);
 }
 
 void operator delete(void* memory, std::size_t) noexcept
 {
-    operator delete(memory);
+    std::free(memory);
 }

@@ -3,7 +3,8 @@
 
 #include <cstddef>
 
-// What the calling thread allocated through `operator new` and nobody released yet, less what it released of others'.
+// What the calling thread allocated and nobody released yet, less what it released of others': by the program itself,
+// not by the libraries that it shares.
 [[nodiscard]] std::ptrdiff_t allocatedBytes() noexcept;
 // Forgets the most there was.
 void forgetMostAllocatedBytes() noexcept;

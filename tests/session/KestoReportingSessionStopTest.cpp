@@ -281,6 +281,23 @@ TEST_F(SessionStop, PaysForVolumeEventsFromItsBudgetUntilTheyAreRecorded)
     EXPECT_EQ(budget->taken(), 0U);
 }
 
+TEST_F(SessionStop, TellsHowMuchMemoryItLetGo)
+{
+    send(0, {{"a", std::string(100'000, 'x')}});
+    EXPECT_EQ(platform.memory.bytesLetGo(), 0U);
+    session->stop();
+    EXPECT_GT(platform.memory.bytesLetGo(), 100'000U);
+    EXPECT_LT(platform.memory.bytesLetGo(), 500'000U);
+}
+
+TEST_F(SessionStop, TellsItTooOfASessionThatGoesWithoutAStop)
+{
+    send(0, {{"a", std::string(100'000, 'x')}});
+    session.reset();
+    EXPECT_GT(platform.memory.bytesLetGo(), 100'000U);
+    EXPECT_LT(platform.memory.bytesLetGo(), 500'000U);
+}
+
 TEST_F(CustomerSessionStop, MeasuresNothingAndWritesNoFileButRecordsTheSummary)
 {
     play();

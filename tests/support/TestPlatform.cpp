@@ -19,7 +19,8 @@ TestPlatform::TestPlatform()
                        .bugCapture = bugCapture,
                        .kernelTrace = kernelTrace,
                        .performanceWriter = performanceWriter,
-                       .fileSystem = fileSystem});
+                       .fileSystem = fileSystem,
+                       .memory = memory});
 }
 
 TestPlatform::~TestPlatform()

@@ -8,6 +8,7 @@
 #include "support/fakes/FakeFiles.h"
 #include "support/fakes/FakeKernelTrace.h"
 #include "support/fakes/FakeLog.h"
+#include "support/fakes/FakeMemory.h"
 #include "support/fakes/FakeNotifications.h"
 #include "support/fakes/FakeReportingChannels.h"
 #include "support/fakes/FakeSettings.h"
@@ -38,6 +39,7 @@ public:
     FakeBugCapture bugCapture;
     FakeKernelTrace kernelTrace;
     FakeFileSystem fileSystem{&workQueues};
+    FakeMemory memory;
     FakePerformanceWriter performanceWriter{fileSystem};
 };
 

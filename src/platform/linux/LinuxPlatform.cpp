@@ -62,7 +62,8 @@ Platform LinuxPlatform::platform()
             .bugCapture = bugCapture_,
             .kernelTrace = kernelTrace_,
             .performanceWriter = performanceWriter_,
-            .fileSystem = fileSystem_};
+            .fileSystem = fileSystem_,
+            .memory = memory_};
 }
 
 } // namespace platform

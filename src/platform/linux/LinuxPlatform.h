@@ -8,14 +8,15 @@
 #pragma once
 
 #include "platform/Platform.h"
-#include "platform/linux/diagnostics/FolderKeeper.h"
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/bugs/LinuxBugCapture.h"
 #include "platform/linux/channels/LinuxReportingChannels.h"
+#include "platform/linux/diagnostics/FolderKeeper.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "platform/linux/log/LinuxLog.h"
 #include "platform/linux/process/LinuxClock.h"
 #include "platform/linux/process/LinuxProcessTable.h"
+#include "platform/linux/queues/LinuxMemory.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/settings/ConfigurationWatcher.h"
 #include "platform/linux/settings/LinuxDeviceProperties.h"
@@ -60,6 +61,7 @@ private:
     LinuxBugCapture bugCapture_;
     TracefsKernelTrace kernelTrace_;
     LinuxPerformanceWriter performanceWriter_;
+    LinuxMemory memory_{workQueues_};
     AnalyticsStore analytics_;
     LinuxWorkQueues workQueues_; // ends first, for its turns end in the store
 };

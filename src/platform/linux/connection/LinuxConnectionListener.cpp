@@ -4,6 +4,7 @@
 
 #include "platform/linux/files/SystemErrorText.h"
 #include "platform/linux/queues/SerialQueue.h"
+#include "platform/linux/queues/ThreadHeap.h"
 
 #include <algorithm>
 #include <array>
@@ -48,7 +49,7 @@ LinuxConnectionListener::create(ListeningSocket socket, LogCategory& log)
         return std::unexpected(systemError());
     std::unique_ptr<LinuxConnectionListener> listener(
         new LinuxConnectionListener(std::move(socket), std::move(epoll), std::move(wake), log));
-    if (!listener->watch(EPOLL_CTL_ADD, listener->wake_.get(), EPOLLIN, &listener->wake_)
+    if (!listener->watch(EPOLL_CTL_ADD, listener->wake_.get(), EPOLLIN | EPOLLET, &listener->wake_)
         || !listener->watch(EPOLL_CTL_ADD, listener->socket_.descriptor(), 0, &listener->socket_))
         return std::unexpected(systemError());
     return listener;
@@ -88,6 +89,7 @@ void LinuxConnectionListener::resume()
 void LinuxConnectionListener::serve()
 {
     SerialQueue::Helper helper;
+    ThreadHeap heap([this] { wake(); });
     while (!isStopping_) {
         std::array<epoll_event, mostEventsAtOnce> events;
         const int count = ::epoll_wait(hub_->epoll.get(), events.data(), events.size(), waitingTime());
@@ -96,12 +98,18 @@ void LinuxConnectionListener::serve()
         if (acceptAgainAt_ && *acceptAgainAt_ <= Clock::now())
             resumeAccepting();
         helper.help();
+        heap.tidyIfAsked();
     }
 }
 
 void LinuxConnectionListener::stop()
 {
     isStopping_ = true;
+    wake();
+}
+
+void LinuxConnectionListener::wake()
+{
     ::eventfd_write(wake_.get(), 1);
 }
 

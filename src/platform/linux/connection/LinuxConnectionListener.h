@@ -68,6 +68,7 @@ private:
 
     [[nodiscard]] bool watch(int operation, int descriptor, std::uint32_t events, void* tag);
     void serve();
+    void wake();
     [[nodiscard]] int waitingTime() const;
     void handle(const epoll_event& event);
     void acceptWaiting();

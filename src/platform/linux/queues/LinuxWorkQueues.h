@@ -1,5 +1,5 @@
-// The room of queues: who runs what, in which order, on which thread. It touches threads and clocks, and knows nothing
-// of what it runs.
+// The room of queues: who runs what, in which order, on which thread. It touches threads, their heaps and clocks, and
+// knows nothing of what it runs.
 //
 // The work queues of the process, on threads of their own.
 #pragma once

@@ -4,6 +4,7 @@
 
 #include "foundation/Mutex.h"
 #include "platform/linux/process/Thread.h"
+#include "platform/linux/queues/ThreadHeap.h"
 
 #include <cassert>
 #include <utility>
@@ -44,8 +45,12 @@ public:
     // The life of the queue's thread.
     void run()
     {
-        while (waitForTurn())
-            runTurn();
+        ThreadHeap heap([this] { wake(); });
+        for (Next next = waitForNext(heap); next != Next::End; next = waitForNext(heap)) {
+            if (next == Next::Turn)
+                runTurn();
+            heap.tidyIfAsked();
+        }
     }
 
     // Runs one turn on another thread, unless the queue's thread sees to it.
@@ -83,19 +88,29 @@ public:
 private:
     static constexpr std::size_t mostRoomKept = 1024; // in items; what a burst needed beyond that is given back
 
-    // False when there will be none.
-    bool waitForTurn()
+    // What the queue's thread does next.
+    enum class Next : std::uint8_t { Turn, Heap, End };
+
+    Next waitForNext(const ThreadHeap& heap)
     {
         const foundation::Lock lock(lock_);
         while (waiting_.empty() || isTurnTaken_) {
             if (isEnding_ && !isTurnTaken_)
-                return false;
+                return Next::End;
+            if (heap.isAsked())
+                return Next::Heap;
             isAsleep_ = true;
             changed_.wait(lock_);
+            isAsleep_ = false;
         }
-        isAsleep_ = false;
         takeTurn();
-        return true;
+        return Next::Turn;
+    }
+
+    void wake()
+    {
+        const foundation::Lock lock(lock_);
+        changed_.notifyOne();
     }
 
     void takeTurn() KESTO_REQUIRES(lock_)
