@@ -36,9 +36,6 @@ if(KESTO_SANITIZE)
   add_compile_options(-fsanitize=${KESTO_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer -g1
     $<$<CXX_COMPILER_ID:Clang>:-fsanitize-ignorelist=${PROJECT_SOURCE_DIR}/cmake/sanitizers-ignorelist.txt>)
   add_link_options(-fsanitize=${KESTO_SANITIZE})
-  if(KESTO_SANITIZE MATCHES thread) # its operator new stays out: some tests count by one of their own
-    add_link_options(-fno-sanitize-link-c++-runtime)
-  endif()
 endif()
 if(KESTO_FUZZ)
   if(NOT CMAKE_CXX_COMPILER_ID STREQUAL Clang)

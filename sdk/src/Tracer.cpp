@@ -9,6 +9,23 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+// The thread sanitizer takes mapping for writing. A page that is put over another one is not written: a thread that
+// reads meanwhile sees the one or the other.
+#if defined(__has_feature)
+#if __has_feature(thread_sanitizer)
+#define KESTO_THREADS_ARE_WATCHED
+#endif
+#elif defined(__SANITIZE_THREAD__)
+#define KESTO_THREADS_ARE_WATCHED
+#endif
+#ifdef KESTO_THREADS_ARE_WATCHED
+extern "C" void AnnotateIgnoreWritesBegin(const char* file, int line);
+extern "C" void AnnotateIgnoreWritesEnd(const char* file, int line);
+#else
+static void AnnotateIgnoreWritesBegin(const char*, int) { }
+static void AnnotateIgnoreWritesEnd(const char*, int) { }
+#endif
+
 namespace libkesto {
 namespace {
 
@@ -23,6 +40,15 @@ bool isPage(const FileDescriptor& file) noexcept
     const int seals = ::fcntl(file.get(), F_GET_SEALS);
     return ::fstat(file.get(), &status) == 0 && status.st_size >= static_cast<off_t>(TraceMarkerPage::size)
         && seals >= 0 && (seals & F_SEAL_SHRINK) != 0;
+}
+
+// Maps a page for reading; with MAP_FIXED it takes the place of the one that is there.
+void* mapPage(void* place, int flags, int file) noexcept
+{
+    AnnotateIgnoreWritesBegin(__FILE__, __LINE__);
+    void* const page = ::mmap(place, TraceMarkerPage::size, PROT_READ, flags, file, 0);
+    AnnotateIgnoreWritesEnd(__FILE__, __LINE__);
+    return page;
 }
 
 } // namespace
@@ -45,7 +71,7 @@ Tracer::~Tracer()
 
 bool Tracer::mapEmptyPage(int flags) noexcept
 {
-    void* const page = ::mmap(page_, TraceMarkerPage::size, PROT_READ, MAP_PRIVATE | MAP_ANONYMOUS | flags, -1, 0);
+    void* const page = mapPage(page_, MAP_PRIVATE | MAP_ANONYMOUS | flags, -1);
     if (page == MAP_FAILED)
         return false;
     page_ = page;
@@ -66,7 +92,7 @@ bool Tracer::attach(TraceDescriptors descriptors) noexcept
 {
     const auto& [marker, page] = descriptors;
     return marker && isPage(page) && ::dup3(marker.get(), marker_.get(), O_CLOEXEC) >= 0
-        && ::mmap(page_, TraceMarkerPage::size, PROT_READ, MAP_SHARED | MAP_FIXED, page.get(), 0) != MAP_FAILED;
+        && mapPage(page_, MAP_SHARED | MAP_FIXED, page.get()) != MAP_FAILED;
 }
 
 // The marker first, too: who sees that nobody traces writes to nobody. Neither can fail for what is there already: no

@@ -1,6 +1,8 @@
 // The program's own operator new sees every request, and remembers the largest.
 #include "foundation/LargestAllocation.h"
 
+#include "support/Sanitizers.h"
+
 #include <algorithm>
 #include <cstdlib>
 #include <new>
@@ -21,6 +23,16 @@ std::size_t largestAllocation() noexcept
     return largest;
 }
 
+#ifdef KESTO_THREADS_ARE_WATCHED
+
+// The sanitizer's calls this. NOLINTNEXTLINE(bugprone-reserved-identifier)
+extern "C" void __sanitizer_malloc_hook(const volatile void*, std::size_t size)
+{
+    largest = std::max(largest, size);
+}
+
+#else
+
 void* operator new(std::size_t size)
 {
     largest = std::max(largest, size);
@@ -38,3 +50,5 @@ void operator delete(void* memory, std::size_t) noexcept
 {
     std::free(memory);
 }
+
+#endif

@@ -2,6 +2,8 @@
 // thread, so that other threads do not disturb it. Operator new is the program's own, so that it is counted as well.
 #include "session/AllocatedBytes.h"
 
+#include "support/Sanitizers.h"
+
 #include <algorithm>
 #include <cstdlib>
 #include <malloc.h>
@@ -71,6 +73,8 @@ void __wrap_free(void* memory)
 }
 // NOLINTEND(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp)
 
+#ifndef KESTO_THREADS_ARE_WATCHED
+
 void* operator new(std::size_t size)
 {
     void* memory = std::malloc(size);
@@ -88,3 +92,5 @@ void operator delete(void* memory, std::size_t) noexcept
 {
     std::free(memory);
 }
+
+#endif

@@ -3,6 +3,7 @@
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
 #include "session/NaiveAggregation.h"
+#include "support/Sanitizers.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>
@@ -569,12 +570,14 @@ void expectToPayForWhatTheyTake(const KestoReportingMessageStore& store, std::si
 
 TEST_F(VolumeMessages, ArePaidForWithWhatTheyTake)
 {
+    KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
     platform.log.setThreshold(Error);
     expectToPayForWhatTheyTake(*storeOfVolumeChanges(200'000), 200'000);
 }
 
 TEST_F(VolumeMessages, ArePaidForWithWhatTheyTakeWhenEachHasATextOfItsOwn)
 {
+    KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
     platform.log.setThreshold(Error);
     Messages payloads{startAt(0)};
     for (int change = 1; change <= 50'000; ++change)
@@ -586,6 +589,7 @@ TEST_F(VolumeMessages, ArePaidForWithWhatTheyTakeWhenEachHasATextOfItsOwn)
 
 TEST_F(VolumeMessages, StayWithinTheirBound)
 {
+    KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
     platform.log.setThreshold(Error);
     const auto store = storeOfVolumeChanges(300'000);
     KestoReportingStorageShare share(KestoReportingStorageBudget::service());

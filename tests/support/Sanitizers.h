@@ -11,11 +11,17 @@
 #define KESTO_SKIP_WHERE_TYPES_ARE_CHECKED() static_cast<void>(0)
 #endif
 
-// The thread sanitizer makes system calls of its own, and has a thread that does not rest.
+// The thread sanitizer makes system calls of its own, and has a thread that does not rest. clang's brings an operator
+// new beside which no other can stand.
 #if defined(__SANITIZE_THREAD__)
-constexpr bool threadSanitizerWatches = true;
+#define KESTO_THREADS_ARE_WATCHED
 #elif defined(__has_feature)
-constexpr bool threadSanitizerWatches = __has_feature(thread_sanitizer);
+#if __has_feature(thread_sanitizer)
+#define KESTO_THREADS_ARE_WATCHED
+#endif
+#endif
+#ifdef KESTO_THREADS_ARE_WATCHED
+constexpr bool threadSanitizerWatches = true;
 #else
 constexpr bool threadSanitizerWatches = false;
 #endif
