@@ -2,13 +2,18 @@
 // under the call's number, or the call is refused, and then nothing was called and nothing is answered. Nobody holds
 // the caller's connection afterwards.
 //
+// Which of the two it is, the table of the operations tells.
+//
 // The input is one CBOR item.
+#include "client/KestoReportingOperations.h"
 #include "client/KestoReportingServiceProtocolAdapter.h"
 #include "foundation/cbor/Cbor.h"
 
+#include <algorithm>
 #include <cstdint>
 #include <cstdlib>
 #include <memory>
+#include <span>
 #include <string>
 #include <string_view>
 #include <utility>
@@ -46,7 +51,7 @@ public:
                      KestoReportingReply reply) override
     {
         ++calls;
-        require(!reporterIDs || reporterIDs->size() <= KestoReportingServiceProtocolAdapter::mostReportersOfAMessage);
+        require(!reporterIDs || reporterIDs->size() <= KestoReportingMostReportersOfAMessage);
         reply(message.empty() ? std::optional(KestoReportingErrorDisabled) : std::nullopt);
     }
     void stopReportingSessionForID(std::int64_t, SuccessReply reply) override { answer(reply, true); }
@@ -87,12 +92,40 @@ public:
     std::vector<std::string> sent;
 };
 
-void requireIsAnswerTo(const Array& call, std::string_view frame)
+bool fits(KestoReportingArgument argument, const Value& value)
+{
+    switch (argument) {
+    case KestoReportingArgument::ReporterID: return value.exactly<std::int64_t>().has_value();
+    case KestoReportingArgument::ServiceType:
+    case KestoReportingArgument::Type: return value.exactly<std::uint16_t>().has_value();
+    case KestoReportingArgument::Category: return value.exactly<std::uint32_t>().has_value();
+    case KestoReportingArgument::Configuration:
+    case KestoReportingArgument::Message: return value.dictionary().has_value();
+    case KestoReportingArgument::ReporterIDs: break;
+    }
+    const auto array = value.array();
+    return array ? array->size() <= KestoReportingMostReportersOfAMessage
+            && std::ranges::all_of(*array, [](const Value& id) { return id.exactly<std::int64_t>().has_value(); })
+                 : value.isNull();
+}
+
+// The operation that the frame calls; null pointer when the frame is not a call.
+const KestoReportingOperation* operationOf(std::span<const Value> frame)
+{
+    if (frame.size() < 2 || !frame[0].exactly<std::uint64_t>())
+        return nullptr;
+    const auto* operation = KestoReportingOperationNumbered(frame[1].exactly<std::int64_t>().value_or(0));
+    return operation != nullptr && std::ranges::equal(operation->arguments(), frame.subspan(2), fits) ? operation
+                                                                                                      : nullptr;
+}
+
+void requireIsAnswerTo(const Array& call, std::string_view frame, KestoReportingResult result)
 {
     foundation::CborDecoder decoder;
     const auto answer = decoder.decode(frame)->array();
-    require(answer && answer->size() >= 2 && (*answer)[0] == call[0]);
-    require((*answer)[1].isNull() || ((*answer)[1].array() && answer->size() == 2));
+    const std::size_t size = result == KestoReportingResult::None ? 2 : 3;
+    require(answer && answer->size() == size && (*answer)[0] == call[0]);
+    require((*answer)[1].isNull() || ((*answer)[1].array() && size == 2));
 }
 
 } // namespace
@@ -110,11 +143,13 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     KestoReportingServiceProtocolAdapter adapter(protocol);
     const auto result = adapter.handleCall({*call, connection});
 
+    const KestoReportingOperation* operation = operationOf(call->values());
+    require(result.has_value() == (operation != nullptr));
     require(connection.use_count() == 1); // nobody answers later
     require(protocol->calls == (result ? 1 : 0));
     require(connection->sent.empty() == (!result || protocol->isKilled));
     require(result || !result.error().reason.empty());
     for (const std::string& frame : connection->sent)
-        requireIsAnswerTo(*call, frame);
+        requireIsAnswerTo(*call, frame, operation->result());
     return 0;
 }

@@ -10,6 +10,7 @@
 
 #include <cstdint>
 #include <optional>
+#include <tuple>
 #include <vector>
 
 // Called on a connection thread; replies are called on the server queue.
@@ -23,7 +24,7 @@ public:
 
     virtual ~KestoReportingServiceProtocol() = default;
 
-    // In the order that numbers them on the wire, from 1.
+    // In the order of `KestoReportingOperations`.
     virtual void createReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
     virtual void setServiceType(AudioServiceType serviceType, std::int64_t reporterID, SuccessReply reply) = 0;
     // Answers ID 0 twice: at once with 65535, and with what the look-up finds.
@@ -42,4 +43,19 @@ public:
     virtual void getAllReporters(ArrayReply reply) = 0;
     // Ends the process with exit status 2; the reply is never called.
     virtual void killService(SuccessReply reply) = 0;
+};
+
+// In the same order.
+inline constexpr std::tuple KestoReportingServiceProtocolOperations{
+    &KestoReportingServiceProtocol::createReportingSession,
+    &KestoReportingServiceProtocol::setServiceType,
+    &KestoReportingServiceProtocol::getServiceNameForReporterID,
+    &KestoReportingServiceProtocol::setConfiguration,
+    &KestoReportingServiceProtocol::startReportingSessionForID,
+    &KestoReportingServiceProtocol::sendMessage,
+    &KestoReportingServiceProtocol::stopReportingSessionForID,
+    &KestoReportingServiceProtocol::destroyReportingSession,
+    &KestoReportingServiceProtocol::reporterID,
+    &KestoReportingServiceProtocol::getAllReporters,
+    &KestoReportingServiceProtocol::killService,
 };

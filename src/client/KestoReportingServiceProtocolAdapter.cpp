@@ -1,12 +1,15 @@
-// One table lists the operations with the number of their arguments; the arguments are taken one by one, and the
-// first that does not fit decides what is said about the call.
+// The table of the operations says what a call is made of, and the operation's parameters say what its arguments
+// become. The arguments are taken one by one, and the first that does not fit decides what is said about the call.
 #include "client/KestoReportingServiceProtocolAdapter.h"
 
+#include "client/KestoReportingOperations.h"
 #include "foundation/cbor/Cbor.h"
 #include "foundation/text/Format.h"
 
 #include <array>
 #include <limits>
+#include <tuple>
+#include <type_traits>
 #include <utility>
 
 namespace {
@@ -22,34 +25,19 @@ class ReplyAddress {
 public:
     ReplyAddress(std::shared_ptr<Connection> caller, std::uint64_t call) : caller_(std::move(caller)), call_(call) { }
 
-    // [call, error, values...], the values appended by `appendValues`.
-    template <typename AppendValues>
-    void answer(const std::optional<KestoReportingError>& error, std::uint64_t valueCount,
-                AppendValues appendValues) const
+    // Sends [call, error, values...].
+    template <typename... Values>
+    void operator()(const std::optional<KestoReportingError>& error, const Values&... values) const
     {
         std::string frame;
-        foundation::appendCborArrayHead(2 + valueCount, frame);
+        foundation::appendCborArrayHead(2 + sizeof...(values), frame);
         foundation::appendCborInteger(call_, frame);
         if (error)
             foundation::appendCbor(Value(Array{Value(error->domain), Value(error->code)}), frame);
         else
             foundation::appendCborNull(frame);
-        appendValues(frame);
+        (foundation::appendCbor(Value(values), frame), ...);
         caller_->send(std::move(frame));
-    }
-
-    // A reply callback with one value, and one with none.
-    template <typename Result> [[nodiscard]] KestoReportingResultReply<Result> withValue() &&
-    {
-        return [address = std::move(*this)](const std::optional<KestoReportingError>& error, Result result) {
-            address.answer(error, 1, [&](std::string& frame) { foundation::appendCbor(Value(result), frame); });
-        };
-    }
-    [[nodiscard]] KestoReportingReply withoutValue() &&
-    {
-        return [address = std::move(*this)](const std::optional<KestoReportingError>& error) {
-            address.answer(error, 0, [](std::string&) { });
-        };
     }
 
 private:
@@ -57,54 +45,83 @@ private:
     std::uint64_t call_;
 };
 
-// Takes the arguments of one call in order. What does not fit is remembered, and what was taken then is not used.
+std::string_view nameOf(KestoReportingArgument argument)
+{
+    switch (argument) {
+    case KestoReportingArgument::ReporterID: return "reporter ID";
+    case KestoReportingArgument::ServiceType: return "service type";
+    case KestoReportingArgument::Configuration: return "configuration";
+    case KestoReportingArgument::Message: return "message";
+    case KestoReportingArgument::Category: return "category";
+    case KestoReportingArgument::Type: return "type";
+    case KestoReportingArgument::ReporterIDs: return "reporter IDs";
+    }
+    return {};
+}
+
+// Gives the parameters of an operation, in order, what a call has for them: its arguments, and at the end the reply.
+// What does not fit is remembered, and what was taken then is not used.
 class Arguments {
 public:
-    explicit Arguments(std::span<const Value> values) : rest_(values) { }
+    using ReporterIDs = KestoReportingServiceProtocol::ReporterIDs;
 
-    template <typename Integer> Integer integer(std::string_view name)
+    // There are as many values as names.
+    Arguments(std::span<const KestoReportingArgument> names, std::span<const Value> values, ReplyAddress reply)
+        : names_(names),
+          values_(values),
+          reply_(std::move(reply))
     {
-        const auto exact = next().exactly<Integer>();
+    }
+
+    template <std::integral Integer> void take(Integer& integer)
+    {
+        const auto exact = value().exactly<Integer>();
         if (!exact)
-            refuse(name,
-                   foundation::format("an integer from {} to {}", std::numeric_limits<Integer>::min(),
+            refuse(foundation::format("an integer from {} to {}", std::numeric_limits<Integer>::min(),
                                       std::numeric_limits<Integer>::max()));
-        return exact.value_or(0);
+        integer = exact.value_or(0);
+        ++taken_;
     }
 
-    Dictionary dictionary(std::string_view name)
+    void take(Dictionary& dictionary)
     {
-        auto dictionary = next().dictionary();
-        if (!dictionary)
-            refuse(name, "a map");
-        return std::move(dictionary).value_or(Dictionary());
+        auto given = value().dictionary();
+        if (!given)
+            refuse("a map");
+        dictionary = std::move(given).value_or(Dictionary());
+        ++taken_;
     }
 
-    std::optional<KestoReportingServiceProtocol::ReporterIDs> reporterIDs(std::string_view name)
+    void take(std::optional<ReporterIDs>& reporterIDs)
     {
-        constexpr std::size_t most = KestoReportingServiceProtocolAdapter::mostReportersOfAMessage;
-        const Value& value = next();
-        if (value.isNull())
-            return std::nullopt;
-        const auto array = value.array();
-        if (!array)
-            refuse(name, "an array or null");
-        else if (array->size() > most)
-            refuse(name, foundation::format("an array of at most {} elements", most));
-        return array && !refusal_ ? integers(*array, name) : KestoReportingServiceProtocol::ReporterIDs();
+        constexpr std::size_t most = KestoReportingMostReportersOfAMessage;
+        const auto array = value().array();
+        if (!array && !value().isNull())
+            refuse("an array or null");
+        else if (array && array->size() > most)
+            refuse(foundation::format("an array of at most {} elements", most));
+        if (array && !refusal_)
+            reporterIDs = integers(*array);
+        ++taken_;
+    }
+
+    template <typename... Results>
+    void take(std::function<void(const std::optional<KestoReportingError>&, Results...)>& reply)
+    {
+        reply = std::move(reply_);
     }
 
     [[nodiscard]] const std::optional<std::string>& refusal() const { return refusal_; }
 
 private:
-    KestoReportingServiceProtocol::ReporterIDs integers(const Array& array, std::string_view name)
+    ReporterIDs integers(const Array& array)
     {
-        KestoReportingServiceProtocol::ReporterIDs integers;
+        ReporterIDs integers;
         integers.reserve(array.size());
         for (const Value& element : array) {
             const auto exact = element.exactly<std::int64_t>();
             if (!exact) {
-                refuse(name, "an array of 64-bit integers");
+                refuse("an array of 64-bit integers");
                 break;
             }
             integers.push_back(*exact);
@@ -112,85 +129,91 @@ private:
         return integers;
     }
 
-    const Value& next()
-    {
-        const Value& value = rest_.front();
-        rest_ = rest_.subspan(1);
-        return value;
-    }
+    [[nodiscard]] const Value& value() const { return values_[taken_]; }
 
-    void refuse(std::string_view name, std::string_view expected)
+    void refuse(std::string_view expected)
     {
         if (!refusal_)
-            refusal_ = foundation::format("argument {} is not {}", name, expected);
+            refusal_ = foundation::format("argument {} is not {}", nameOf(names_[taken_]), expected);
     }
 
-    std::span<const Value> rest_;
+    std::span<const KestoReportingArgument> names_;
+    std::span<const Value> values_;
+    ReplyAddress reply_;
+    std::size_t taken_ = 0;
     std::optional<std::string> refusal_;
 };
 
 using Protocol = KestoReportingServiceProtocol;
-// Takes the arguments, and calls the operation unless one was refused.
-using Operation = void (*)(Protocol&, Arguments&, ReplyAddress);
-
-struct Method {
-    std::string_view name;
-    std::size_t argumentCount;
-    Operation call;
-};
-
-// An operation whose only argument is a reporter ID.
-template <typename Result>
-using ReporterOperation = void (Protocol::*)(std::int64_t reporterID, KestoReportingResultReply<Result> reply);
-
-template <typename Result, ReporterOperation<Result> operation>
-void callWithReporterID(Protocol& protocol, Arguments& arguments, ReplyAddress reply)
+// Takes the parameters, and calls the operation unless one was refused.
+template <typename... Parameters>
+void callWith(Arguments& arguments, Protocol& protocol, void (Protocol::*operation)(Parameters...))
 {
-    const auto reporterID = arguments.integer<std::int64_t>("reporter ID");
-    if (!arguments.refusal())
-        (protocol.*operation)(reporterID, std::move(reply).template withValue<Result>());
+    std::tuple<Parameters...> parameters;
+    std::apply(
+        [&](Parameters&... each) {
+            (arguments.take(each), ...);
+            if (!arguments.refusal())
+                (protocol.*operation)(std::move(each)...);
+        },
+        parameters);
 }
 
-constexpr std::array<Method, 11> methods{{
-    {"createReportingSession", 1, callWithReporterID<bool, &Protocol::createReportingSession>},
-    {"setServiceType", 2,
-     [](Protocol& protocol, Arguments& arguments, ReplyAddress reply) {
-         const auto serviceType = arguments.integer<AudioServiceType>("service type");
-         const auto reporterID = arguments.integer<std::int64_t>("reporter ID");
-         if (!arguments.refusal())
-             protocol.setServiceType(serviceType, reporterID, std::move(reply).withValue<bool>());
-     }},
-    {"getServiceNameForReporterID", 1, callWithReporterID<AudioServiceType, &Protocol::getServiceNameForReporterID>},
-    {"setConfiguration", 2,
-     [](Protocol& protocol, Arguments& arguments, ReplyAddress reply) {
-         auto configuration = arguments.dictionary("configuration");
-         const auto reporterID = arguments.integer<std::int64_t>("reporter ID");
-         if (!arguments.refusal())
-             protocol.setConfiguration(std::move(configuration), reporterID, std::move(reply).withValue<bool>());
-     }},
-    {"startReportingSessionForID", 1, callWithReporterID<bool, &Protocol::startReportingSessionForID>},
-    {"sendMessage", 4,
-     [](Protocol& protocol, Arguments& arguments, ReplyAddress reply) {
-         auto message = arguments.dictionary("message");
-         const auto category = arguments.integer<AudioEventCategory>("category");
-         const auto type = arguments.integer<std::uint16_t>("type");
-         auto reporterIDs = arguments.reporterIDs("reporter IDs");
-         if (!arguments.refusal())
-             protocol.sendMessage(std::move(message), category, type, std::move(reporterIDs),
-                                  std::move(reply).withoutValue());
-     }},
-    {"stopReportingSessionForID", 1, callWithReporterID<bool, &Protocol::stopReportingSessionForID>},
-    {"destroyReportingSession", 1, callWithReporterID<bool, &Protocol::destroyReportingSession>},
-    {"reporterID", 1, callWithReporterID<const Dictionary&, &Protocol::reporterID>},
-    {"getAllReporters", 0,
-     [](Protocol& protocol, Arguments&, ReplyAddress reply) {
-         protocol.getAllReporters(std::move(reply).withValue<const Array&>());
-     }},
-    {"killService", 0,
-     [](Protocol& protocol, Arguments&, ReplyAddress reply) {
-         protocol.killService(std::move(reply).withValue<bool>());
-     }},
-}};
+using Call = void (*)(Arguments&, Protocol&);
+
+// How each operation is called.
+constexpr auto calls = []<std::size_t... places>(std::index_sequence<places...>) {
+    return std::array<Call, sizeof...(places)>{[](Arguments& arguments, Protocol& protocol) {
+        callWith(arguments, protocol, std::get<places>(KestoReportingServiceProtocolOperations));
+    }...};
+}(std::make_index_sequence<KestoReportingOperations.size()>());
+
+// Whether a parameter can hold every value of the argument.
+template <typename Parameter> constexpr bool holds(KestoReportingArgument argument)
+{
+    switch (argument) {
+    case KestoReportingArgument::ReporterID: return std::is_same_v<Parameter, std::int64_t>;
+    case KestoReportingArgument::ServiceType:
+    case KestoReportingArgument::Type: return std::is_same_v<Parameter, std::uint16_t>;
+    case KestoReportingArgument::Category: return std::is_same_v<Parameter, std::uint32_t>;
+    case KestoReportingArgument::Configuration:
+    case KestoReportingArgument::Message: return std::is_same_v<Parameter, Dictionary>;
+    case KestoReportingArgument::ReporterIDs:
+        return std::is_same_v<Parameter, std::optional<KestoReportingServiceProtocol::ReporterIDs>>;
+    }
+    return false;
+}
+
+// Whether a reply brings the result.
+template <typename Reply> constexpr bool brings(KestoReportingResult result)
+{
+    switch (result) {
+    case KestoReportingResult::None: return std::is_same_v<Reply, KestoReportingReply>;
+    case KestoReportingResult::Success: return std::is_same_v<Reply, Protocol::SuccessReply>;
+    case KestoReportingResult::ServiceType: return std::is_same_v<Reply, Protocol::ServiceTypeReply>;
+    case KestoReportingResult::Validity: return std::is_same_v<Reply, Protocol::DictionaryReply>;
+    case KestoReportingResult::ReporterIDs: return std::is_same_v<Reply, Protocol::ArrayReply>;
+    }
+    return false;
+}
+
+template <typename... Parameters>
+consteval bool isDeclaredAs(const KestoReportingOperation& operation, void (Protocol::*)(Parameters...))
+{
+    const auto arguments = operation.arguments();
+    std::size_t place = 0;
+    const auto fits = [&]<typename Parameter>(std::type_identity<Parameter>) {
+        return place == arguments.size() ? brings<Parameter>(operation.result()) : holds<Parameter>(arguments[place++]);
+    };
+    return sizeof...(Parameters) == arguments.size() + 1 && (fits(std::type_identity<Parameters>()) && ...);
+}
+static_assert(
+    []<std::size_t... places>(std::index_sequence<places...>) {
+        return (
+            isDeclaredAs(KestoReportingOperations[places], std::get<places>(KestoReportingServiceProtocolOperations))
+            && ...);
+    }(std::make_index_sequence<std::tuple_size_v<decltype(KestoReportingServiceProtocolOperations)>>()),
+    "the protocol declares an operation otherwise than the table of the operations");
 
 std::unexpected<Connection::Violation> violation(std::string reason)
 {
@@ -209,18 +232,20 @@ std::expected<void, Connection::Violation> KestoReportingServiceProtocolAdapter:
     if (!callNumber)
         return violation("a call's number is an unsigned 64-bit integer");
     const auto methodNumber = values[1].exactly<std::int64_t>();
+    constexpr std::size_t methodCount = KestoReportingOperations.size();
     if (!methodNumber) // not repeated to the log, where it could fill a disk or forge lines
-        return violation(foundation::format("a call's method is an integer from 1 to {}", methods.size()));
-    if (*methodNumber < 1 || std::cmp_greater(*methodNumber, methods.size()))
-        return violation(foundation::format("unknown method {}; there are 1 to {}", *methodNumber, methods.size()));
-    const Method& method = methods[static_cast<std::size_t>(*methodNumber) - 1];
-    if (values.size() - headCount != method.argumentCount)
-        return violation(foundation::format("{} takes {} arguments, not {}", method.name, method.argumentCount,
-                                            values.size() - headCount));
+        return violation(foundation::format("a call's method is an integer from 1 to {}", methodCount));
+    const KestoReportingOperation* operation = KestoReportingOperationNumbered(*methodNumber);
+    if (operation == nullptr)
+        return violation(foundation::format("unknown method {}; there are 1 to {}", *methodNumber, methodCount));
+    const auto given = values.subspan(headCount);
+    if (given.size() != operation->arguments().size())
+        return violation(foundation::format("{} takes {} arguments, not {}", operation->name(),
+                                            operation->arguments().size(), given.size()));
 
-    Arguments arguments(values.subspan(headCount));
-    method.call(*exportedObject_, arguments, ReplyAddress(std::move(call.caller), *callNumber));
+    Arguments arguments(operation->arguments(), given, ReplyAddress(std::move(call.caller), *callNumber));
+    calls[static_cast<std::size_t>(*methodNumber) - 1](arguments, *exportedObject_);
     if (arguments.refusal())
-        return violation(foundation::format("{}: {}", method.name, *arguments.refusal()));
+        return violation(foundation::format("{}: {}", operation->name(), *arguments.refusal()));
     return {};
 }

@@ -14,9 +14,6 @@
 // One a connection, which owns it; used on the connection's thread.
 class KestoReportingServiceProtocolAdapter {
 public:
-    // A message to more is refused: each of them is worth as much work as the message, and takes a byte of the frame.
-    static constexpr std::size_t mostReportersOfAMessage = 10'000;
-
     // Calls go to the exported object.
     explicit KestoReportingServiceProtocolAdapter(std::shared_ptr<KestoReportingServiceProtocol> exportedObject)
         : exportedObject_(std::move(exportedObject))

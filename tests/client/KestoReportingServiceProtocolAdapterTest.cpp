@@ -1,6 +1,7 @@
 // What is on the wire, call by call: which operation a frame means, what is refused and in which words, and how
 // answers look.
 #include "client/KestoReportingServiceProtocolAdapter.h"
+#include "client/KestoReportingOperations.h"
 #include "support/fakes/FakeConnection.h"
 
 #include <gmock/gmock.h>
@@ -264,7 +265,7 @@ TEST_F(AdapterTest, RefusesListsOfAnythingButIntegers)
 // A message is worth as much work at each of them, and each takes no more than a byte of the frame.
 TEST_F(AdapterTest, RefusesListsOfMoreReportersThanAMessageMayHave)
 {
-    constexpr std::size_t most = KestoReportingServiceProtocolAdapter::mostReportersOfAMessage;
+    constexpr std::size_t most = KestoReportingMostReportersOfAMessage;
     const auto listOf = [](std::size_t count) { return Array(std::vector<Value>(count, Value(42))); };
     using testing::_;
     EXPECT_CALL(*protocol, sendMessage(_, _, _, Optional(testing::SizeIs(most)), _));

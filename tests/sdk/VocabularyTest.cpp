@@ -1,4 +1,5 @@
 // The numbers of the public headers are those of the service.
+#include "client/KestoReportingOperations.h"
 #include "utility/KestoReportingVocabulary.h"
 
 #include "kesto/kesto.hpp"
@@ -74,6 +75,25 @@ TEST(Vocabulary, EventTypesAreTheServices)
          {EventType::Unknown, "Unknown"}}};
     for (const auto& [type, name] : names)
         EXPECT_EQ(KestoReportingUtilityTypeString(static_cast<AudioEventType>(type)), name);
+}
+
+TEST(Vocabulary, OperationsAreTheServices)
+{
+    using kesto::Operation;
+    constexpr std::array<std::pair<Operation, std::string_view>, 11> names{
+        {{Operation::CreateSession, "createReportingSession"},
+         {Operation::SetServiceType, "setServiceType"},
+         {Operation::GetServiceType, "getServiceNameForReporterID"},
+         {Operation::SetConfiguration, "setConfiguration"},
+         {Operation::StartSession, "startReportingSessionForID"},
+         {Operation::Send, "sendMessage"},
+         {Operation::StopSession, "stopReportingSessionForID"},
+         {Operation::DestroySession, "destroyReportingSession"},
+         {Operation::Validate, "reporterID"},
+         {Operation::GetAllReporters, "getAllReporters"},
+         {Operation::KillService, "killService"}}};
+    for (const auto& [operation, name] : names)
+        EXPECT_EQ(KestoReportingOperationNumbered(static_cast<std::int64_t>(operation))->name(), name);
 }
 
 TEST(Vocabulary, ServiceTypesAreTheServices)

@@ -2,6 +2,7 @@
 #include "calls/Client.h"
 
 #include "BlockedSignals.h"
+#include "client/KestoReportingOperations.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -128,9 +129,8 @@ kesto_status kesto_client::setConfiguration(const libkesto::MessageEncoder& conf
 // In the queue, and in a frame that the service takes.
 bool kesto_client::fits(std::size_t entryBytes, std::size_t reporterCount) const noexcept
 {
-    constexpr std::size_t mostReporters = 10'000;
     const std::size_t most = std::min(mailbox_.largestRecord(), platform::longestFrame);
-    return reporterCount <= mostReporters
+    return reporterCount <= KestoReportingMostReportersOfAMessage
         && entryBytes + libkesto::frameOverhead(reporterCount) + sizeof(CallHead) <= most;
 }
 

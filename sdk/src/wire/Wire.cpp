@@ -1,9 +1,9 @@
 // A call's shape is known, so its frame is written straight from what the caller gave, without values in between.
 #include "wire/Wire.h"
 
+#include "client/KestoReportingOperations.h"
 #include "platform/linux/connection/FrameReader.h"
 
-#include <cassert>
 #include <cstring>
 #include <span>
 
@@ -32,38 +32,21 @@ void appendReporters(const Call& call, std::string& out)
         appendReporter(reporter, out);
 }
 
-void appendArguments(const Call& call, std::string& out)
+const KestoReportingOperation& operationOf(kesto_operation operation)
 {
-    switch (call.head.operation) {
-    case KESTO_OPERATION_SET_SERVICE_TYPE:
-        foundation::appendCborInteger(call.head.type, out);
-        return appendReporter(call.head.reporter, out);
-    case KESTO_OPERATION_SET_CONFIGURATION: appendEntries(call, out); return appendReporter(call.head.reporter, out);
-    case KESTO_OPERATION_SEND:
-        appendEntries(call, out);
-        foundation::appendCborInteger(call.head.category, out);
-        foundation::appendCborInteger(call.head.type, out);
-        return appendReporters(call, out);
-    case KESTO_OPERATION_GET_ALL_REPORTERS:
-    case KESTO_OPERATION_KILL_SERVICE: return;
-    case KESTO_OPERATION_CREATE_SESSION:
-    case KESTO_OPERATION_GET_SERVICE_TYPE:
-    case KESTO_OPERATION_START_SESSION:
-    case KESTO_OPERATION_STOP_SESSION:
-    case KESTO_OPERATION_DESTROY_SESSION:
-    case KESTO_OPERATION_VALIDATE: return appendReporter(call.head.reporter, out);
-    }
+    return *KestoReportingOperationNumbered(operation);
 }
 
-std::uint64_t argumentCount(kesto_operation operation) noexcept
+void appendArgument(KestoReportingArgument argument, const Call& call, std::string& out)
 {
-    switch (operation) {
-    case KESTO_OPERATION_GET_ALL_REPORTERS:
-    case KESTO_OPERATION_KILL_SERVICE: return 0;
-    case KESTO_OPERATION_SET_SERVICE_TYPE:
-    case KESTO_OPERATION_SET_CONFIGURATION: return 2;
-    case KESTO_OPERATION_SEND: return 4;
-    default: return 1;
+    switch (argument) {
+    case KestoReportingArgument::ReporterID: return appendReporter(call.head.reporter, out);
+    case KestoReportingArgument::Configuration:
+    case KestoReportingArgument::Message: return appendEntries(call, out);
+    case KestoReportingArgument::Category: return foundation::appendCborInteger(call.head.category, out);
+    case KestoReportingArgument::ServiceType:
+    case KestoReportingArgument::Type: return foundation::appendCborInteger(call.head.type, out);
+    case KestoReportingArgument::ReporterIDs: return appendReporters(call, out);
     }
 }
 
@@ -72,7 +55,7 @@ template <typename Integer> std::optional<Integer> integer(const Value* value)
     return value == nullptr ? std::nullopt : value->exactly<Integer>();
 }
 
-bool readReporters(const Value& value, std::vector<kesto_reporter>& reporters)
+bool readReporters(const Value& value, kesto_answer& answer, std::vector<kesto_reporter>& reporters)
 {
     const auto array = value.array();
     if (!array)
@@ -84,7 +67,16 @@ bool readReporters(const Value& value, std::vector<kesto_reporter>& reporters)
             return false;
         reporters.push_back(*reporter);
     }
+    answer.reporters = reporters.data();
+    answer.reporter_count = reporters.size();
     return true;
+}
+
+bool readServiceType(const Value& value, kesto_answer& answer)
+{
+    const auto type = value.exactly<kesto_service_type>();
+    answer.service_type = type.value_or(0);
+    return type.has_value();
 }
 
 bool readValidity(const Value& value, kesto_answer& answer)
@@ -131,10 +123,12 @@ void appendCall(std::uint64_t number, const Call& call, std::string& out)
 {
     std::string frame;
     frame.reserve(frameOverhead(call.reporters.size()) + call.entries.size());
-    foundation::appendCborArrayHead(2 + argumentCount(call.head.operation), frame);
+    const auto arguments = operationOf(call.head.operation).arguments();
+    foundation::appendCborArrayHead(2 + arguments.size(), frame);
     foundation::appendCborInteger(number, frame);
     foundation::appendCborInteger(static_cast<std::uint64_t>(call.head.operation), frame);
-    appendArguments(call, frame);
+    for (const KestoReportingArgument argument : arguments)
+        appendArgument(argument, call, frame);
     platform::appendFrame(frame, out);
 }
 
@@ -175,26 +169,20 @@ std::optional<AnswerFrame> readAnswer(std::string_view frame, foundation::CborDe
 bool readResult(const AnswerFrame& frame, kesto_answer& answer, std::vector<kesto_reporter>& reporters)
 {
     const std::span<const Value> values = frame.frame.values().subspan(2);
-    if (answer.operation == KESTO_OPERATION_SEND)
+    const KestoReportingResult result = operationOf(answer.operation).result();
+    if (result == KestoReportingResult::None)
         return values.empty();
     if (values.size() != 1)
         return false;
     const Value& value = values.front();
-    switch (answer.operation) {
-    case KESTO_OPERATION_GET_SERVICE_TYPE: {
-        const auto type = integer<kesto_service_type>(&value);
-        answer.service_type = type.value_or(0);
-        return type.has_value();
+    switch (result) {
+    case KestoReportingResult::None: break;
+    case KestoReportingResult::Success: return readSuccess(value, answer);
+    case KestoReportingResult::ServiceType: return readServiceType(value, answer);
+    case KestoReportingResult::Validity: return readValidity(value, answer);
+    case KestoReportingResult::ReporterIDs: return readReporters(value, answer, reporters);
     }
-    case KESTO_OPERATION_VALIDATE: return readValidity(value, answer);
-    case KESTO_OPERATION_GET_ALL_REPORTERS:
-        if (!readReporters(value, reporters))
-            return false;
-        answer.reporters = reporters.data();
-        answer.reporter_count = reporters.size();
-        return true;
-    default: return readSuccess(value, answer);
-    }
+    return false;
 }
 
 } // namespace libkesto

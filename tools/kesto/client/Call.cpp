@@ -1,10 +1,10 @@
-// A table lists what each operation is called and which arguments it takes, in order; the arguments are read one by
-// one, and the first that does not fit ends it.
+// The table of the operations says which arguments each takes, in order; the arguments are read one by one, and the
+// first that does not fit ends it. A table of the tool's own adds how a person names an operation and what it calls.
 #include "kesto/client/Call.h"
 
+#include "client/KestoReportingOperations.h"
 #include "kesto/Names.h"
 
-#include <algorithm>
 #include <array>
 #include <fmt/format.h>
 #include <rapidjson/document.h>
@@ -14,29 +14,53 @@ namespace {
 
 using Json = rapidjson::Value;
 
-enum class Argument : std::uint8_t { None, Reporter, ServiceType, Configuration, Message, Category, Type, Reporters };
+using Argument = KestoReportingArgument;
+
+// An operation that takes a reporter and nothing else.
+using ReporterOperation = kesto::Status (kesto::Client::*)(kesto::ReporterID reporter, kesto::AnswerCallback answered);
+
+template <ReporterOperation operation>
+kesto::Status submitReporter(kesto::Client& client, const Call& call, kesto::AnswerCallback answered)
+{
+    return (client.*operation)(call.reporter, std::move(answered));
+}
 
 struct Form {
-    kesto::Operation operation;
-    std::string_view name;
     std::string_view shortName;
-    std::array<Argument, 4> arguments;
+    kesto::Status (*submit)(kesto::Client& client, const Call& call, kesto::AnswerCallback answered);
 };
 
-using enum Argument;
-constexpr std::array<Form, 11> forms{{
-    {kesto::Operation::CreateSession, "createReportingSession", "create", {Reporter}},
-    {kesto::Operation::SetServiceType, "setServiceType", "setServiceType", {ServiceType, Reporter}},
-    {kesto::Operation::GetServiceType, "getServiceNameForReporterID", "getServiceName", {Reporter}},
-    {kesto::Operation::SetConfiguration, "setConfiguration", "setConfiguration", {Configuration, Reporter}},
-    {kesto::Operation::StartSession, "startReportingSessionForID", "start", {Reporter}},
-    {kesto::Operation::Send, "sendMessage", "send", {Message, Category, Type, Reporters}},
-    {kesto::Operation::StopSession, "stopReportingSessionForID", "stop", {Reporter}},
-    {kesto::Operation::DestroySession, "destroyReportingSession", "destroy", {Reporter}},
-    {kesto::Operation::Validate, "reporterID", "validate", {Reporter}},
-    {kesto::Operation::GetAllReporters, "getAllReporters", "getAllReporters", {}},
-    {kesto::Operation::KillService, "killService", "kill", {}},
-}};
+// In the order of `KestoReportingOperations`.
+constexpr auto forms = std::to_array<Form>({
+    {"create", submitReporter<&kesto::Client::createSession>},
+    {"setServiceType",
+     [](kesto::Client& client, const Call& call, kesto::AnswerCallback answered) {
+         return client.setServiceType(call.serviceType, call.reporter, std::move(answered));
+     }},
+    {"getServiceName", submitReporter<&kesto::Client::getServiceType>},
+    {"setConfiguration",
+     [](kesto::Client& client, const Call& call, kesto::AnswerCallback answered) {
+         return client.setConfiguration(call.message, call.reporter, std::move(answered));
+     }},
+    {"start", submitReporter<&kesto::Client::startSession>},
+    {"send",
+     [](kesto::Client& client, const Call& call, kesto::AnswerCallback answered) {
+         const auto to = call.reporters ? kesto::Reporters(*call.reporters) : kesto::Reporters::allStarted();
+         return client.send(call.message, call.category, call.type, to, std::move(answered));
+     }},
+    {"stop", submitReporter<&kesto::Client::stopSession>},
+    {"destroy", submitReporter<&kesto::Client::destroySession>},
+    {"validate", submitReporter<&kesto::Client::validate>},
+    {"getAllReporters",
+     [](kesto::Client& client, const Call&, kesto::AnswerCallback answered) {
+         return client.getAllReporters(std::move(answered));
+     }},
+    {"kill",
+     [](kesto::Client& client, const Call&, kesto::AnswerCallback answered) {
+         return client.killService(std::move(answered));
+     }},
+});
+static_assert(forms.size() == KestoReportingOperations.size());
 
 constexpr unsigned deepest = 30; // what the service takes inside a call
 
@@ -124,17 +148,16 @@ bool readReporters(const Json& json, std::optional<std::vector<kesto::ReporterID
 bool read(Argument argument, const Json& json, Call& call)
 {
     switch (argument) {
-    case Reporter:
+    case Argument::ReporterID:
         if (json.IsInt64())
             call.reporter = json.GetInt64();
         return json.IsInt64();
-    case ServiceType: return readNumberOrName(json, call.serviceType, serviceTypeNamed);
-    case Category: return readNumberOrName(json, call.category, categoryNamed);
-    case Type: return readNumberOrName(json, call.type, eventTypeNamed);
-    case Configuration:
-    case Message: return readMessage(json, call.message);
-    case Reporters: return readReporters(json, call.reporters);
-    case None: break;
+    case Argument::ServiceType: return readNumberOrName(json, call.serviceType, serviceTypeNamed);
+    case Argument::Category: return readNumberOrName(json, call.category, categoryNamed);
+    case Argument::Type: return readNumberOrName(json, call.type, eventTypeNamed);
+    case Argument::Configuration:
+    case Argument::Message: return readMessage(json, call.message);
+    case Argument::ReporterIDs: return readReporters(json, call.reporters);
     }
     return false;
 }
@@ -142,34 +165,43 @@ bool read(Argument argument, const Json& json, Call& call)
 std::string_view description(Argument argument)
 {
     switch (argument) {
-    case Reporter: return "a reporter ID (a 64-bit integer)";
-    case ServiceType: return "a service type (its number, or a name such as \"longformaudio\")";
-    case Configuration: return "a configuration (an object)";
-    case Message: return "a message (an object, at most 1 MiB, not too deep)";
-    case Category: return "a category (its number, or a name such as \"Playback\" or \"DSP_Playback\")";
-    case Type: return "an event type (its number, or a name such as \"Start\")";
-    case Reporters: return "a list of reporter IDs, or null for all";
-    case None: break;
+    case Argument::ReporterID: return "a reporter ID (a 64-bit integer)";
+    case Argument::ServiceType: return "a service type (its number, or a name such as \"longformaudio\")";
+    case Argument::Configuration: return "a configuration (an object)";
+    case Argument::Message: return "a message (an object, at most 1 MiB, not too deep)";
+    case Argument::Category: return "a category (its number, or a name such as \"Playback\" or \"DSP_Playback\")";
+    case Argument::Type: return "an event type (its number, or a name such as \"Start\")";
+    case Argument::ReporterIDs: return "a list of reporter IDs, or null for all";
     }
     return "nothing";
 }
 
-const Form* formNamed(std::string_view name)
+// The place of the operation among all of them.
+std::optional<std::size_t> placeNamed(std::string_view name)
 {
-    for (const Form& form : forms)
-        if (form.name == name || form.shortName == name)
-            return &form;
-    return nullptr;
+    for (std::size_t place = 0; place < forms.size(); ++place)
+        if (KestoReportingOperations[place].name() == name || forms[place].shortName == name)
+            return place;
+    return std::nullopt;
+}
+
+// "create, start and kill"
+std::string shortNames()
+{
+    std::string names;
+    for (const Form& form : forms) {
+        if (!names.empty())
+            names += &form == &forms.back() ? " and " : ", ";
+        names += form.shortName;
+    }
+    return names;
 }
 
 } // namespace
 
-std::string_view operationName(kesto::Operation operation)
+kesto::Status submit(kesto::Client& client, const Call& call, kesto::AnswerCallback answered)
 {
-    for (const Form& form : forms)
-        if (form.operation == operation)
-            return form.name;
-    return "unknown";
+    return forms[static_cast<std::size_t>(call.operation) - 1].submit(client, call, std::move(answered));
 }
 
 std::expected<Call, std::string> parseCall(std::string_view line)
@@ -183,23 +215,21 @@ std::expected<Call, std::string> parseCall(std::string_view line)
                                            document.GetErrorOffset() + 1));
     if (!document.IsArray() || document.Empty() || !document[0].IsString())
         return std::unexpected(R"(a call is an array that begins with an operation, such as ["create", 42])");
-    const Form* form = formNamed(textOf(document[0]));
-    if (form == nullptr)
+    const auto place = placeNamed(textOf(document[0]));
+    if (!place)
         return std::unexpected(
-            fmt::format("unknown operation \"{}\"; there are create, setServiceType, getServiceName, setConfiguration, "
-                        "start, send, stop, destroy, validate, getAllReporters and kill",
-                        textOf(document[0])));
+            fmt::format("unknown operation \"{}\"; there are {}", textOf(document[0]), shortNames()));
 
-    const auto last = std::ranges::find(form->arguments, None);
-    const auto expected = static_cast<rapidjson::SizeType>(last - form->arguments.begin());
-    if (document.Size() - 1 != expected)
+    const auto arguments = KestoReportingOperations[*place].arguments();
+    const std::string_view name = forms[*place].shortName;
+    if (document.Size() - 1 != arguments.size())
         return std::unexpected(
-            fmt::format("{} takes {} arguments, not {}", form->shortName, expected, document.Size() - 1));
+            fmt::format("{} takes {} arguments, not {}", name, arguments.size(), document.Size() - 1));
     Call call;
-    call.operation = form->operation;
-    for (rapidjson::SizeType index = 0; index < expected; ++index)
-        if (!read(form->arguments[index], document[index + 1], call))
-            return std::unexpected(fmt::format("argument {} of {} is not {}", index + 1, form->shortName,
-                                               description(form->arguments[index])));
+    call.operation = static_cast<kesto::Operation>(*place + 1);
+    for (rapidjson::SizeType index = 0; index < arguments.size(); ++index)
+        if (!read(arguments[index], document[index + 1], call))
+            return std::unexpected(
+                fmt::format("argument {} of {} is not {}", index + 1, name, description(arguments[index])));
     return call;
 }

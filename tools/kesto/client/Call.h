@@ -22,5 +22,5 @@ struct Call {
 // The call, or what is wrong with the line and what was expected.
 [[nodiscard]] std::expected<Call, std::string> parseCall(std::string_view line);
 
-// The operation's name, as it is printed: the first keyword of the service's own.
-[[nodiscard]] std::string_view operationName(kesto::Operation operation);
+// Has the client carry it out.
+[[nodiscard]] kesto::Status submit(kesto::Client& client, const Call& call, kesto::AnswerCallback answered);

@@ -1,5 +1,6 @@
 // `kesto client`: every operation of the service from a shell. One JSON array a line in, one JSON object an answer
 // out, as they come.
+#include "client/KestoReportingOperations.h"
 #include "foundation/values/Json.h"
 #include "foundation/values/Value.h"
 #include "kesto/Commands.h"
@@ -24,22 +25,28 @@ struct ClientOptions {
     double wait = 10;
 };
 
+const KestoReportingOperation& operationOf(const kesto::Answer& answer)
+{
+    return *KestoReportingOperationNumbered(static_cast<std::int64_t>(answer.operation()));
+}
+
 Value valuesOf(const kesto::Answer& answer)
 {
-    switch (answer.operation()) {
-    case kesto::Operation::Send: return Array();
-    case kesto::Operation::GetServiceType: return Array{static_cast<int>(answer.serviceType())};
-    case kesto::Operation::Validate:
+    switch (operationOf(answer).result()) {
+    case KestoReportingResult::None: break;
+    case KestoReportingResult::Success: return Array{answer.success()};
+    case KestoReportingResult::ServiceType: return Array{static_cast<int>(answer.serviceType())};
+    case KestoReportingResult::Validity:
         return Array{Dictionary{{"reporterID", answer.validReporter()},
                                 {"serviceType", static_cast<int>(answer.serviceType())}}};
-    case kesto::Operation::GetAllReporters: {
+    case KestoReportingResult::ReporterIDs: {
         std::vector<Value> reporters;
         for (const kesto::ReporterID reporter : answer.reporters())
             reporters.emplace_back(reporter);
         return Array{Value(Array(std::move(reporters)))}; // a list in a list: without Value some compilers copy it
     }
-    default: return Array{answer.success()};
     }
+    return Array();
 }
 
 std::string lineOf(const kesto::Answer& answer)
@@ -48,7 +55,7 @@ std::string lineOf(const kesto::Answer& answer)
         answer.ok() ? Value() : Value(Dictionary{{"domain", answer.errorDomain()}, {"code", answer.errorCode()}});
     std::string line;
     foundation::appendJsonText(Dictionary{{"call", answer.call()},
-                                          {"operation", operationName(answer.operation())},
+                                          {"operation", operationOf(answer).name()},
                                           {"error", error},
                                           {"values", answer.ok() ? valuesOf(answer) : Value(Array())}},
                                line);
@@ -122,10 +129,11 @@ private:
             unanswered_ += awaited;
             isKilling_ |= call->operation == kesto::Operation::KillService;
         }
-        kesto::Status status = submit(*call);
+        const auto answered = [this](const kesto::Answer& answer) { print(answer); };
+        kesto::Status status = submit(client_, *call, answered);
         while (status == kesto::Status::QueueFull) {
             client_.flush(std::chrono::milliseconds(100));
-            status = submit(*call);
+            status = submit(client_, *call, answered);
         }
         if (status == kesto::Status::Ok)
             return;
@@ -136,28 +144,6 @@ private:
         if (!isOver_)
             fmt::print(stderr, "kesto client: line {}: {}\n", number, kesto::errorText(status));
         hasFailed_ = true;
-    }
-
-    kesto::Status submit(const Call& call)
-    {
-        const auto answered = [this](const kesto::Answer& answer) { print(answer); };
-        switch (call.operation) {
-        case kesto::Operation::CreateSession: return client_.createSession(call.reporter, answered);
-        case kesto::Operation::SetServiceType: return client_.setServiceType(call.serviceType, call.reporter, answered);
-        case kesto::Operation::GetServiceType: return client_.getServiceType(call.reporter, answered);
-        case kesto::Operation::SetConfiguration: return client_.setConfiguration(call.message, call.reporter, answered);
-        case kesto::Operation::StartSession: return client_.startSession(call.reporter, answered);
-        case kesto::Operation::Send:
-            return client_.send(call.message, call.category, call.type,
-                                call.reporters ? kesto::Reporters(*call.reporters) : kesto::Reporters::allStarted(),
-                                answered);
-        case kesto::Operation::StopSession: return client_.stopSession(call.reporter, answered);
-        case kesto::Operation::DestroySession: return client_.destroySession(call.reporter, answered);
-        case kesto::Operation::Validate: return client_.validate(call.reporter, answered);
-        case kesto::Operation::GetAllReporters: return client_.getAllReporters(answered);
-        case kesto::Operation::KillService: return client_.killService(answered);
-        }
-        return kesto::Status::InvalidArgument;
     }
 
     // On the library's thread, as what follows.
