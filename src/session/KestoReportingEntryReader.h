@@ -2,38 +2,34 @@
 //
 // A player sends the same keys in the same order, and most of its values are what they were. So what stands at a place
 // is compared, still encoded, with what stood there in the payload of its kind before: equal bytes are an equal entry.
-// One comparison then saves taking the entry apart, and saves the reader of a million messages to derive from it
-// what it has derived already.
+// One comparison then saves taking the entry apart.
+//
+// An entry that is as before is given as the item that it was before. So a reader of a million messages keeps the item
+// from which it derived something, and asks `isSameAs` whether it has to derive it again.
 #pragma once
 
+#include "foundation/cbor/Cbor.h"
 #include "foundation/cbor/CborView.h"
 #include "session/KestoReportingMessageStore.h"
 
 #include <algorithm>
 #include <array>
 #include <cstdint>
+#include <deque>
+#include <string>
 #include <string_view>
 #include <vector>
 
-// `Note` is what the reader wants to know of a key; it is kept with the place. Valid as long as the store records
-// nothing. One thread at a time.
+// `Note` is what the reader wants to know of a key; it is kept with the place. One thread at a time.
 template <typename Note> class KestoReportingEntryReader {
 public:
-    // Calls `visit(note, value)` for each entry, in order. `learn(key)` is asked for the note, unless it is known from
-    // the payload before. The value is a `foundation::CborItem`, or a `foundation::Value` where the payload is not
-    // encoded. An item that equals the one before at its place is that item: its bytes stand where they stood.
+    // Calls `visit(note, item)` for each entry, in order. `learn(key)` is asked for the note, unless it is known from
+    // the payload before. The items are valid as long as the entry reader, and the store records nothing.
     template <typename Learn, typename Visit>
     void read(std::uint32_t kind, const KestoReportingMessageStore::Payload& payload, Learn learn, Visit visit)
     {
-        if (payload.kept() != nullptr) {
-            for (const auto& [key, value] : *payload.kept()) {
-                Note note = learn(key.view());
-                visit(note, value);
-            }
-            return;
-        }
         auto& places = places_[kind % places_.size()];
-        std::string_view rest = foundation::CborItem(payload.encoded()).content();
+        std::string_view rest = foundation::CborItem(encoded(payload)).content();
         for (std::size_t index = 0; !rest.empty(); ++index) {
             if (index == places.size() && index < mostPlaces)
                 places.emplace_back();
@@ -41,7 +37,7 @@ public:
             if (place.entry.empty() || !rest.starts_with(place.entry))
                 place.take(rest, learn);
             rest.remove_prefix(place.entry.size());
-            visit(place.note, place.value);
+            visit(place.note, place.item);
         }
     }
 
@@ -49,23 +45,32 @@ private:
     struct Place {
         std::string_view entry; // encoded, the key and the value
         std::string_view key; // the same of the key alone
-        foundation::CborItem value;
+        foundation::CborItem item; // the value
         Note note{};
 
         template <typename Learn> void take(std::string_view from, Learn learn)
         {
             if (key.empty() || !from.starts_with(key)) {
-                const auto item = foundation::CborItem::at(from.data());
-                key = item.bytes();
-                note = learn(item.content());
+                const auto name = foundation::CborItem::at(from.data());
+                key = name.bytes();
+                note = learn(name.content());
             }
-            value = foundation::CborItem::at(from.data() + key.size());
-            entry = from.substr(0, key.size() + value.bytes().size());
+            item = foundation::CborItem::at(from.data() + key.size());
+            entry = from.substr(0, key.size() + item.bytes().size());
         }
     };
     // More of both share what there is: they are read as well, only not remembered for long.
     static constexpr std::size_t mostKinds = 8;
     static constexpr std::size_t mostPlaces = 64;
 
+    std::string_view encoded(const KestoReportingMessageStore::Payload& payload)
+    {
+        if (payload.kept() == nullptr)
+            return payload.encoded();
+        foundation::appendCbor(*payload.kept(), encodedHere_.emplace_back());
+        return encodedHere_.back();
+    }
+
+    std::deque<std::string> encodedHere_; // which the store keeps unencoded
     std::array<std::vector<Place>, mostKinds> places_;
 };

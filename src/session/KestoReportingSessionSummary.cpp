@@ -1,6 +1,7 @@
 // The session's summary: every value that each key took, in one event, and on internal builds the whole message
 // store as a file that diagnostic tools read.
 #define KESTO_LOG_NAME "KestoReportingSession"
+#include "foundation/cbor/Cbor.h"
 #include "foundation/text/Format.h"
 #include "foundation/text/LocalTime.h"
 #include "foundation/text/PrettyJsonWriter.h"
@@ -44,21 +45,18 @@ public:
         return values_.size() - 1;
     }
 
-    // The item last given for the key, at the place where it was, is a repetition, which costs next to nothing.
-    template <typename Item> void append(std::size_t position, const Item& value)
+    // What says the same as the last of the key is a repetition, which costs next to nothing.
+    void append(std::size_t position, foundation::CborItem value)
     {
         last_ = position;
         Values& values = values_[position];
-        const char* place = nullptr;
-        if constexpr (requires { value.bytes(); })
-            place = value.bytes().data();
-        if (place != nullptr && place == values.place) {
+        if (values.last.isSameAs(value)) {
             ++values.repetitions;
             return;
         }
         appendRepetitions(values);
         appendText(values, value);
-        values.place = place;
+        values.last = value;
     }
 
     // Whether the budget had too little memory, which makes all further work vain.
@@ -83,13 +81,13 @@ private:
         foundation::String key;
         foundation::StringBuilder text = {}; // with a comma behind each value
         std::size_t lastSize = 0; // of the last value's text, with its comma
-        const char* place = nullptr; // of the last value, if it is encoded
+        foundation::CborItem last = {};
         std::size_t repetitions = 0; // of the last value that are still to be written
     };
     static constexpr std::size_t bytesOfAKey = 256; // in all that knows it, here and in the dictionary
     static constexpr std::size_t paidAtOnce = 4096;
 
-    template <typename Item> void appendText(Values& values, const Item& value)
+    void appendText(Values& values, foundation::CborItem value)
     {
         if (isOutOfMemory_)
             return;
@@ -159,25 +157,19 @@ bool isSummaryFileName(std::string_view name)
 // What stands at a place of the payloads, as it was written last.
 struct WrittenEntry {
     std::string_view key;
-    const char* place = nullptr; // of the value; null while no text is kept
+    foundation::CborItem value = {}; // none while no text is kept
     std::string text = {};
 };
 
 void writeEntry(foundation::PrettyJsonWriter& writer, WrittenEntry& entry, foundation::CborItem value)
 {
     constexpr std::size_t longestKept = 1024;
-    if (entry.place == value.bytes().data())
+    if (entry.value.isSameAs(value))
         return writer.writeMember(entry.text);
     writer.writeMember(entry.key, value, entry.text);
-    entry.place = value.bytes().data();
+    entry.value = value;
     if (entry.text.size() > longestKept)
         entry = {.key = entry.key};
-}
-
-void writeEntry(foundation::PrettyJsonWriter& writer, const WrittenEntry& entry, const foundation::Value& value)
-{
-    writer.key(entry.key);
-    writer.write(value);
 }
 
 // An array of one-entry objects, identifier to payload. False when the store holds what JSON cannot say.
@@ -192,7 +184,7 @@ bool writeJson(const KestoReportingMessageStore& store, foundation::PrettyJsonWr
         writer.beginObject();
         entries.read(
             message.kind, message.payload, [](std::string_view key) { return WrittenEntry{.key = key}; },
-            [&](WrittenEntry& entry, const auto& value) { writeEntry(writer, entry, value); });
+            [&](WrittenEntry& entry, foundation::CborItem value) { writeEntry(writer, entry, value); });
         writer.endObject();
         writer.endObject();
     });
@@ -207,14 +199,16 @@ std::optional<Dictionary> KestoReportingSession::createSummaryEventForSession() 
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
     if (!nestedAggregatedPayloadData_ || nestedAggregatedPayloadData_->empty())
         return std::nullopt;
+    std::string serviceType;
+    foundation::appendCbor(foundation::Value(serviceType_.load()), serviceType);
     ValuesByKey values(budget_);
-    values.append(values.positionOf(summaryKey), foundation::Value(serviceType_.load()));
+    values.append(values.positionOf(summaryKey), foundation::CborItem(serviceType));
     KestoReportingEntryReader<std::size_t> entries;
     KestoReportingMessageStore::Cursor cursor(*nestedAggregatedPayloadData_);
     while (!values.isOutOfMemory() && cursor.next())
         entries.read(
             cursor.kind(), cursor.payload(), [&](std::string_view key) { return values.positionOf(key); },
-            [&](std::size_t position, const auto& value) { values.append(position, value); });
+            [&](std::size_t position, foundation::CborItem value) { values.append(position, value); });
     auto summary = std::move(values).finish();
     if (!summary) {
         ++messagesLost_;

@@ -159,7 +159,7 @@ private:
 
     [[nodiscard]] bool changesText(const Fields& payload, Key key) const
     {
-        return payload.has(key) && !payload.isSameEncoding(state_, key)
+        return payload.has(key) && !payload.isSame(state_, key)
             && payload.value(key).text() != state_.value(key).text();
     }
 
@@ -177,7 +177,7 @@ private:
     void merge(const Fields& payload)
     {
         for (std::size_t index = 0; index < stateValues_.size(); ++index)
-            if (const auto key = static_cast<Key>(index); payload.has(key) && !payload.isSameEncoding(state_, key))
+            if (const auto key = static_cast<Key>(index); payload.has(key) && !payload.isSame(state_, key))
                 stateValues_[index].reset();
         if (payload.has(Key::OutputRunning))
             stateIsRunning_ = payload.boolean(Key::OutputRunning);

@@ -85,13 +85,9 @@ void KestoReportingVolumeFields::merge(const KestoReportingVolumeFields& other)
 KestoReportingVolumeFields KestoReportingVolumeFieldsReader::read(const KestoReportingMessageStore::Cursor& message)
 {
     KestoReportingVolumeFields fields;
-    entries_.read(message.kind(), message.payload(), keyOf, [&](std::optional<Key> key, const auto& value) {
-        if (!key)
-            return;
-        if constexpr (requires { value.bytes(); })
-            fields.set(*key, value);
-        else
-            fields.set(*key, keep(value));
+    entries_.read(message.kind(), message.payload(), keyOf, [&](std::optional<Key> key, foundation::CborItem item) {
+        if (key)
+            fields.set(*key, item);
     });
     return fields;
 }

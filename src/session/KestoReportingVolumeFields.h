@@ -42,12 +42,10 @@ public:
     // The value as it counts where a number or a truth value is asked for.
     [[nodiscard]] foundation::Number number(Key key) const;
     [[nodiscard]] bool boolean(Key key) const;
-    // Whether both are the same bytes, and so surely equal text. Mostly they even stand at the same place.
-    [[nodiscard]] bool isSameEncoding(const KestoReportingVolumeFields& other, Key key) const
+    // Whether both say the same of the key, told by the encoding alone.
+    [[nodiscard]] bool isSame(const KestoReportingVolumeFields& other, Key key) const
     {
-        const std::string_view ours = item(key).bytes();
-        const std::string_view theirs = other.item(key).bytes();
-        return ours.data() == theirs.data() || ours == theirs;
+        return item(key).isSameAs(other.item(key));
     }
 
     void set(Key key, foundation::CborItem item) { items_[static_cast<std::size_t>(key)] = item; }

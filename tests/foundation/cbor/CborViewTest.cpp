@@ -147,6 +147,17 @@ TEST(CborView, GoesOverContainersAsDeepAsTheyAre)
     EXPECT_EQ(CborItem(bytes).value(), Value(Array{deep, "end"}));
 }
 
+TEST(CborView, IsSameAsAnItemOfTheSameBytesWhereverTheyStand)
+{
+    const std::string bytes = "\x61\x61\x61\x61\x61\x62\x01"; // "a", "a", "b", 1
+    const char* const place = bytes.data();
+    EXPECT_TRUE(CborItem::at(place).isSameAs(CborItem::at(place)));
+    EXPECT_TRUE(CborItem::at(place).isSameAs(CborItem::at(place + 2)));
+    EXPECT_FALSE(CborItem::at(place).isSameAs(CborItem::at(place + 4)));
+    EXPECT_FALSE(CborItem::at(place).isSameAs(CborItem::at(place + 6)));
+    EXPECT_FALSE(CborItem::at(place).isSameAs(CborItem()));
+}
+
 TEST(CborView, HasNoBytesWhereNothingWasPut)
 {
     EXPECT_TRUE(CborItem().bytes().empty());
