@@ -74,7 +74,7 @@ try {
 
 using Made = std::expected<std::unique_ptr<kesto_channel>, kesto_status>;
 
-Made makeHistogram(libkesto::ChangeBell& bell, const char* unit, std::span<const std::int64_t> bounds)
+Made makeHistogram(libkesto::Doorbell& bell, const char* unit, std::span<const std::int64_t> bounds)
 {
     if (bounds.size() < 2 || !std::ranges::is_sorted(bounds, std::less_equal()))
         return std::unexpected(KESTO_INVALID_ARGUMENT);
@@ -89,7 +89,7 @@ Made makeHistogram(libkesto::ChangeBell& bell, const char* unit, std::span<const
                                                         std::vector(bounds.begin(), bounds.end()));
 }
 
-Made makeState(libkesto::ChangeBell& bell, std::span<const char* const> states, std::size_t first)
+Made makeState(libkesto::Doorbell& bell, std::span<const char* const> states, std::size_t first)
 {
     if (first >= states.size())
         return std::unexpected(KESTO_INVALID_ARGUMENT);
@@ -156,7 +156,7 @@ kesto_status kesto_channel_create_simple(kesto_publisher* publisher, const kesto
                                          kesto_channel** channel)
 {
     return create(publisher, name, channel,
-                  [](libkesto::ChangeBell& bell) { return Made(std::make_unique<libkesto::SimpleChannel>(bell)); });
+                  [](libkesto::Doorbell& bell) { return Made(std::make_unique<libkesto::SimpleChannel>(bell)); });
 }
 
 kesto_status kesto_channel_create_histogram(kesto_publisher* publisher, const kesto_channel_name* name,
@@ -164,8 +164,7 @@ kesto_status kesto_channel_create_histogram(kesto_publisher* publisher, const ke
                                             kesto_channel** channel)
 {
     const std::span given(bounds, bounds == nullptr ? 0 : bound_count);
-    return create(publisher, name, channel,
-                  [&](libkesto::ChangeBell& bell) { return makeHistogram(bell, unit, given); });
+    return create(publisher, name, channel, [&](libkesto::Doorbell& bell) { return makeHistogram(bell, unit, given); });
 }
 
 kesto_status kesto_channel_create_state(kesto_publisher* publisher, const kesto_channel_name* name,
@@ -173,7 +172,7 @@ kesto_status kesto_channel_create_state(kesto_publisher* publisher, const kesto_
                                         kesto_channel** channel)
 {
     const std::span given(states, states == nullptr ? 0 : state_count);
-    return create(publisher, name, channel, [&](libkesto::ChangeBell& bell) { return makeState(bell, given, first); });
+    return create(publisher, name, channel, [&](libkesto::Doorbell& bell) { return makeState(bell, given, first); });
 }
 
 void kesto_channel_destroy(kesto_channel* channel)

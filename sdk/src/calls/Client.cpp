@@ -8,7 +8,6 @@
 #include <cerrno>
 #include <new>
 #include <string>
-#include <sys/eventfd.h>
 #include <system_error>
 #include <unistd.h>
 
@@ -23,7 +22,7 @@ std::string_view bytesOf(std::span<const kesto_reporter> reporters) noexcept
 
 std::unique_ptr<kesto_client> kesto_client::create(Settings settings)
 {
-    platform::FileDescriptor doorbell(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
+    platform::FileDescriptor doorbell = libkesto::Doorbell::makeDescriptor();
     if (!doorbell)
         return nullptr;
     return std::unique_ptr<kesto_client>(new kesto_client(std::move(settings), std::move(doorbell)));

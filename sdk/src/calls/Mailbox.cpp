@@ -1,7 +1,6 @@
-// Both halves of the handshake between callers and a thread that goes to sleep.
+// What is put first, and who rings then.
 #include "calls/Mailbox.h"
 
-#include <sys/eventfd.h>
 #include <utility>
 
 namespace libkesto {
@@ -9,7 +8,7 @@ namespace libkesto {
 Mailbox::Mailbox(std::size_t bytes, platform::FileDescriptor doorbell)
     : bytes_(bytes),
       queue_(bytes),
-      doorbell_(std::move(doorbell))
+      bell_(std::move(doorbell))
 {
 }
 
@@ -18,8 +17,8 @@ bool Mailbox::putMessage(const CallHead& head, std::string_view reporters, std::
     const std::size_t keptForOtherCalls = bytes_ / 8;
     if (!queue_.push({bytesOf(head), reporters, entries}, keptForOtherCalls))
         return false;
-    if (isAsleep_.load() && startsUnderway_.load() == 0 && isAsleep_.exchange(false))
-        ring();
+    if (startsUnderway_.load() == 0)
+        bell_.ringIfAsleep();
     return true;
 }
 
@@ -31,13 +30,8 @@ bool Mailbox::putCall(const CallHead& head) noexcept
     const bool hasRoom = queue_.push({bytesOf(head)});
     if (!hasRoom && isStart)
         --startsUnderway_;
-    ring(); // without room too: for messages that counted on this start to ring
+    bell_.ring(); // without room too: for messages that counted on this start to ring
     return hasRoom;
-}
-
-void Mailbox::ring() noexcept
-{
-    eventfd_write(doorbell_.get(), 1); // fails only when it has been rung 2^64 times and not been heard
 }
 
 void Mailbox::popFront() noexcept
@@ -50,19 +44,11 @@ void Mailbox::popFront() noexcept
 
 bool Mailbox::fallAsleep() noexcept
 {
-    isAsleep_.store(true);
+    bell_.fallAsleep();
     if (queue_.isEmpty())
         return true;
-    isAsleep_.store(false);
+    bell_.stayAwake();
     return false;
-}
-
-void Mailbox::wakeUp(bool hasRung) noexcept
-{
-    isAsleep_.store(false);
-    eventfd_t rings = 0;
-    if (hasRung)
-        eventfd_read(doorbell_.get(), &rings);
 }
 
 } // namespace libkesto

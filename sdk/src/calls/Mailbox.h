@@ -2,14 +2,14 @@
 // that `send` makes no system call while a session is started.
 //
 // Waking a thread is a system call. So a thread that expects messages looks into the queue by itself from time to
-// time, and only one that is going to sleep until it is woken says so, in `isAsleep_`: the first caller that sees it
-// takes the flag back and rings. Callers first claim room in the queue and then look at the flag, the thread first
-// sets the flag and then looks at the queue; both are sequentially consistent, so one of them sees the other.
+// time, and only one that is going to sleep until it is woken has callers ring (`Doorbell`): they first claim room in
+// the queue and then look whether it sleeps.
 //
 // The one moment in between: a start was given, the thread has not taken it yet, and may be asleep or about to be. The
 // start rings in any case, so nobody who sends meanwhile needs to: `startsUnderway_` tells them.
 #pragma once
 
+#include "Doorbell.h"
 #include "calls/CallQueue.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "wire/Wire.h"
@@ -24,7 +24,7 @@ namespace libkesto {
 
 class Mailbox {
 public:
-    // `doorbell` is an event descriptor that does not block.
+    // `doorbell` is made by `Doorbell`.
     Mailbox(std::size_t bytes, platform::FileDescriptor doorbell);
 
     // For messages: no system call unless the thread sleeps. False when there is no room. Any thread.
@@ -32,7 +32,7 @@ public:
     // For all other calls, which find room when messages find none any more. Rings in any case. Any thread.
     [[nodiscard]] bool putCall(const CallHead& head) noexcept;
     // Any thread.
-    void ring() noexcept;
+    void ring() noexcept { bell_.ring(); }
     // Largest record that a message may be: smaller than what is ever free when the queue is empty.
     [[nodiscard]] std::size_t largestRecord() const noexcept { return bytes_ / 4; }
     // Where the queue stands, to tell when everything that was put before has been taken. Any thread.
@@ -47,14 +47,13 @@ public:
     // something was put meanwhile, or is being put: it must not wait for long then.
     [[nodiscard]] bool fallAsleep() noexcept;
     // After waiting, in any case.
-    void wakeUp(bool hasRung) noexcept;
-    [[nodiscard]] int doorbell() const noexcept { return doorbell_.get(); }
+    void wakeUp(bool hasRung) noexcept { bell_.wakeUp(hasRung); }
+    [[nodiscard]] int doorbell() const noexcept { return bell_.descriptor(); }
 
 private:
     const std::size_t bytes_;
     CallQueue queue_;
-    const platform::FileDescriptor doorbell_;
-    std::atomic<bool> isAsleep_ = false;
+    Doorbell bell_;
     std::atomic<std::uint32_t> startsUnderway_ = 0; // given and not taken from the queue yet
 };
 

@@ -33,7 +33,7 @@ void SimpleChannel::appendText(std::string& text, Time)
     foundation::format_to(std::back_inserter(text), "simple\n{}\n", value_.load());
 }
 
-HistogramChannel::HistogramChannel(ChangeBell& bell, std::string unit, std::vector<std::int64_t> bounds)
+HistogramChannel::HistogramChannel(Doorbell& bell, std::string unit, std::vector<std::int64_t> bounds)
     : kesto_channel(bell),
       unit_(std::move(unit)),
       bounds_(std::move(bounds)),
@@ -68,7 +68,7 @@ void HistogramChannel::appendText(std::string& text, Time)
         foundation::format_to(out, "{} {} {}\n", bounds_[bucket], bounds_[bucket + 1], hits_[bucket].load());
 }
 
-StateChannel::StateChannel(ChangeBell& bell, std::vector<std::string> names, std::size_t first, Time now)
+StateChannel::StateChannel(Doorbell& bell, std::vector<std::string> names, std::size_t first, Time now)
     : kesto_channel(bell),
       begin_(now),
       states_(names.size()),

@@ -4,7 +4,7 @@
 // old, but no count in it ever goes back, since that would say that the channel has begun anew.
 #pragma once
 
-#include "channels/ChangeBell.h"
+#include "Doorbell.h"
 #include "kesto/channels.h"
 
 #include <atomic>
@@ -29,7 +29,7 @@ struct kesto_channel {
 public:
     using Time = libkesto::ChannelClock::time_point;
 
-    explicit kesto_channel(libkesto::ChangeBell& bell) noexcept : bell_(bell) { }
+    explicit kesto_channel(libkesto::Doorbell& bell) noexcept : bell_(bell) { }
     virtual ~kesto_channel() = default;
     kesto_channel(const kesto_channel&) = delete;
     kesto_channel& operator=(const kesto_channel&) = delete;
@@ -58,11 +58,11 @@ protected:
     void changed() noexcept
     {
         if (!isChanged_.load() && !isChanged_.exchange(true))
-            bell_.tell();
+            bell_.ringIfAsleep();
     }
 
 private:
-    libkesto::ChangeBell& bell_;
+    libkesto::Doorbell& bell_;
     kesto_publisher* publisher_ = nullptr;
     std::atomic<bool> isChanged_ = false;
 };
@@ -84,7 +84,7 @@ private:
 class HistogramChannel final : public kesto_channel {
 public:
     // The bounds ascend.
-    HistogramChannel(ChangeBell& bell, std::string unit, std::vector<std::int64_t> bounds);
+    HistogramChannel(Doorbell& bell, std::string unit, std::vector<std::int64_t> bounds);
 
     kesto_status record(std::int64_t value) noexcept override;
     void appendText(std::string& text, Time now) override;
@@ -101,7 +101,7 @@ private:
 
 class StateChannel final : public kesto_channel {
 public:
-    StateChannel(ChangeBell& bell, std::vector<std::string> names, std::size_t first, Time now);
+    StateChannel(Doorbell& bell, std::vector<std::string> names, std::size_t first, Time now);
 
     kesto_status enter(std::size_t state, Time now) noexcept override;
     [[nodiscard]] bool isTimed() const noexcept override { return true; }

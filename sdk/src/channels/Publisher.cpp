@@ -39,7 +39,7 @@ kesto_publisher::kesto_publisher(Settings settings, platform::FileDescriptor doo
 
 std::unique_ptr<kesto_publisher> kesto_publisher::create(Settings settings)
 {
-    platform::FileDescriptor doorbell(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
+    platform::FileDescriptor doorbell = libkesto::Doorbell::makeDescriptor();
     if (!doorbell)
         return nullptr;
     std::unique_ptr<kesto_publisher> publisher(new kesto_publisher(std::move(settings), std::move(doorbell)));

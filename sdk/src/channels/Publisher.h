@@ -6,7 +6,7 @@
 #pragma once
 
 #include "Counters.h"
-#include "channels/ChangeBell.h"
+#include "Doorbell.h"
 #include "channels/Channel.h"
 #include "channels/ChannelFolder.h"
 #include "foundation/Mutex.h"
@@ -49,7 +49,7 @@ public:
     // parent's.
     [[nodiscard]] bool isOfThisProcess() const noexcept { return process_ == ::getpid(); }
     // What channels tell their changes.
-    [[nodiscard]] libkesto::ChangeBell& bell() noexcept { return bell_; }
+    [[nodiscard]] libkesto::Doorbell& bell() noexcept { return bell_; }
     // Writes the channel's first file; null, and the status, when it cannot be. May throw std::bad_alloc.
     [[nodiscard]] std::expected<kesto_channel*, kesto_status> add(std::unique_ptr<kesto_channel> channel,
                                                                   libkesto::ChannelPlace place, std::string name);
@@ -81,7 +81,7 @@ private:
     const pid_t process_; // that made it
     const Settings settings_;
     const std::string owner_; // what it calls itself in its files
-    libkesto::ChangeBell bell_;
+    libkesto::Doorbell bell_;
     libkesto::Counter filesWritten_;
     libkesto::Counter filesFailed_;
     std::atomic<bool> isEnding_ = false;

@@ -31,7 +31,7 @@ protected:
     }
 
     const CallHead message_{.operation = KESTO_OPERATION_SEND};
-    Mailbox mailbox_{4096, platform::FileDescriptor(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK))};
+    Mailbox mailbox_{4096, libkesto::Doorbell::makeDescriptor()};
 };
 
 TEST_F(MailboxTest, MessagesDoNotRingWhileTheThreadIsAwake)

@@ -10,7 +10,7 @@
 
 namespace {
 
-using libkesto::ChangeBell;
+using libkesto::Doorbell;
 using libkesto::HistogramChannel;
 using libkesto::SimpleChannel;
 using libkesto::StateChannel;
@@ -48,7 +48,7 @@ protected:
     }
 
     const int doorbell = ::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-    ChangeBell bell{platform::FileDescriptor(doorbell)};
+    Doorbell bell{platform::FileDescriptor(doorbell)};
     const kesto_channel::Time begin = libkesto::ChannelClock::now();
 };
 
