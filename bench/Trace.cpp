@@ -1,10 +1,10 @@
 // What a trace costs once it has ended: pairing its events, and everything from its stop to the results file.
 #include "Groups.h"
-#include "platform/ExchangedProviders.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
 #include "support/ChildProcess.h"
+#include "support/ExchangedProviders.h"
 #include "support/InProcessPlatform.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"
@@ -50,6 +50,7 @@ private:
 
         void setCompletionHandler(std::function<void()> handler) override { complete_ = std::move(handler); }
         void enableWallTimes(bool) override { }
+        [[nodiscard]] std::uint64_t lostEvents() const override { return 0; }
         int filterEventRange(std::uint32_t, std::uint32_t, std::function<void(const trace_point&)> handler) override
         {
             handler_ = std::move(handler);
@@ -118,7 +119,7 @@ public:
         : performanceWriter_(files, platform::ProviderLog(platform::current().log))
     {
         platform::install(
-            platform::withExchanged(platform::current(), workQueues_, kernelTrace, performanceWriter_, files));
+            support::withExchanged(platform::current(), workQueues_, kernelTrace, performanceWriter_, files));
     }
 
 private:

@@ -1,10 +1,9 @@
 // The platform of what is measured inside this process: nothing on it costs time, so that the service's own work is
 // what remains. Whatever is submitted to a queue is done at once; nobody wants any event; nothing is logged that is
-// not logged by default, and that goes nowhere. There are no files, unless a file system is given: then it is that of
-// an internal build, which writes some.
+// not logged by default, and that goes nowhere; no driver publishes a channel, and nothing traces. There are no files,
+// unless a file system is given: then it is that of an internal build, which writes some.
 #pragma once
 
-#include "platform/Absent.h"
 #include "platform/Platform.h"
 
 #include <string>
@@ -122,6 +121,55 @@ private:
         [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
         void sendAnalyticsEventLazy(std::string_view, PayloadBuilder) override { }
     };
+    class TraceMarkers final : public platform::TraceMarkers {
+        void emit(std::uint32_t, const std::array<std::uint64_t, 4>&) override { }
+    };
+    class ReportingChannels final : public platform::ReportingChannels {
+        FoundChannels copyChannelsInGroup(std::optional<std::string_view>, std::optional<std::string_view>) override
+        {
+            return {};
+        }
+        [[nodiscard]] std::size_t channelCount(const ChannelSet&) const override { return 0; }
+        Subscribed createSubscription(const ChannelSet&) override
+        {
+            return {.subscription = nullptr, .channels = nullptr, .error = unavailable};
+        }
+        std::expected<platform::ReportingSample, platform::ReportingChannelError>
+        createSamples(const Subscription&, const ChannelSet&) override
+        {
+            return std::unexpected(unavailable);
+        }
+        std::expected<platform::ReportingSample, platform::ReportingChannelError>
+        createDifference(const platform::ReportingSample&, const platform::ReportingSample&) override
+        {
+            return std::unexpected(unavailable);
+        }
+        static constexpr platform::ReportingChannelError unavailable = 1;
+    };
+    class BugCapture final : public platform::BugCapture {
+        class Reporter final : public platform::BugCaptureReporter {
+            void requestSnapshot(foundation::Dictionary, double, const std::optional<foundation::Value>&,
+                                 const std::optional<foundation::Value>&, Reply reply) override
+            {
+                reply({{"success", false}});
+            }
+        };
+        [[nodiscard]] std::unique_ptr<platform::BugCaptureReporter> makeReporter() override
+        {
+            return std::make_unique<Reporter>();
+        }
+    };
+    class KernelTrace final : public platform::KernelTrace {
+        [[nodiscard]] bool isAvailable() override { return false; }
+        [[nodiscard]] std::unique_ptr<platform::KernelTraceSession> createTraceSession() override { return nullptr; }
+    };
+    class PerformanceWriter final : public platform::PerformanceWriter {
+        [[nodiscard]] std::unique_ptr<platform::PerformanceFile> open(const std::filesystem::path&, std::string_view,
+                                                                      std::uint32_t) override
+        {
+            return nullptr;
+        }
+    };
     class FileSystem final : public platform::FileSystem {
         [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return {}; }
         [[nodiscard]] std::expected<void, std::error_code> createDirectories(const std::filesystem::path&,
@@ -141,6 +189,9 @@ private:
             return std::unexpected(std::make_error_code(std::errc::permission_denied));
         }
     };
+    class Memory final : public platform::Memory {
+        void letGo(std::size_t) override { }
+    };
 
     Log log_;
     Clock clock_;
@@ -151,13 +202,13 @@ private:
     ProcessTable processTable_;
     Notifications notifications_;
     Analytics analytics_;
-    platform::AbsentTraceMarkers traceMarkers_;
-    platform::AbsentReportingChannels reportingChannels_;
-    platform::AbsentBugCapture bugCapture_;
-    platform::AbsentKernelTrace kernelTrace_;
-    platform::AbsentPerformanceWriter performanceWriter_;
+    TraceMarkers traceMarkers_;
+    ReportingChannels reportingChannels_;
+    BugCapture bugCapture_;
+    KernelTrace kernelTrace_;
+    PerformanceWriter performanceWriter_;
     FileSystem fileSystem_;
-    platform::AbsentMemory memory_;
+    Memory memory_;
 };
 
 } // namespace bench

@@ -1,8 +1,8 @@
 // Driver logs of channels that are really published, as files: all of a session's road from the file to the event, with
 // everything that files may do in between.
 #include "driver/KestoReportingDriverUtility.h"
-#include "platform/ExchangedProviders.h"
 #include "platform/linux/channels/LinuxReportingChannels.h"
+#include "support/ExchangedProviders.h"
 #include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
 
@@ -23,7 +23,7 @@ class DriverChannels : public testing::Test {
 protected:
     DriverChannels()
     {
-        platform::install(platform::withExchanged(platform::current(), channels));
+        platform::install(support::withExchanged(platform::current(), channels));
         fakes.analytics.use("com.quarn.kesto.*");
     }
 

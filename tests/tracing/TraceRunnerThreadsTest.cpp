@@ -1,8 +1,8 @@
 // Runners on real queues, with a kernel trace whose events come from a thread of its own: whatever happens at once,
 // results hold every interval that was delivered before the end, and nothing is touched by two threads. What two
 // threads must not do shows under the thread sanitizer.
-#include "platform/ExchangedProviders.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
+#include "support/ExchangedProviders.h"
 #include "support/TestPlatform.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"
@@ -82,7 +82,7 @@ class RunnerThreads : public testing::Test {
 protected:
     RunnerThreads()
     {
-        platform::install(platform::withExchanged(platform::current(), workQueues, kernelTrace));
+        platform::install(support::withExchanged(platform::current(), workQueues, kernelTrace));
         platform.log.setThreshold(platform::LogLevel::Error);
     }
 
