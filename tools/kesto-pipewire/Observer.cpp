@@ -2,6 +2,8 @@
 // is noted with its time, and dealt with in the loop's next turn.
 #include "kesto-pipewire/Observer.h"
 
+#include "platform/linux/process/Environment.h"
+
 #include <pipewire/context.h>
 #include <pipewire/extensions/profiler.h>
 #include <pipewire/impl.h>
@@ -9,7 +11,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdlib>
 #include <system_error>
 
 namespace kesto_pipewire {
@@ -21,21 +22,15 @@ namespace {
 constexpr double firstPause = 0.1;
 constexpr double longestPause = 30;
 
-std::string environment(const char* name)
-{
-    const auto* value = std::getenv(name);
-    return value ? value : "";
-}
-
 // Where PipeWire's own library looks for the server's socket.
 std::filesystem::path socketPath(std::string remote)
 {
     if (remote.empty())
-        remote = environment("PIPEWIRE_REMOTE");
+        remote = platform::environment("PIPEWIRE_REMOTE");
     if (remote.empty())
         remote = "pipewire-0";
     for (const auto* folder : {"PIPEWIRE_RUNTIME_DIR", "XDG_RUNTIME_DIR", "USERPROFILE"})
-        if (const auto path = environment(folder); !path.empty())
+        if (const auto path = platform::environment(folder); !path.empty())
             return std::filesystem::path(path) / remote; // which an absolute path replaces
     return std::filesystem::path("/run/pipewire") / remote;
 }

@@ -10,8 +10,8 @@ namespace kesto_pipewire {
 
 constexpr std::size_t maximumNameBytes = 255;
 
-// The text cut to that many bytes, never within a character. In text that is not UTF-8, every byte that is
-// not ASCII becomes "?". Any thread.
+// The text cut to that many bytes, never within a character. Each byte that is not part of a UTF-8 character becomes
+// "?". Any thread.
 [[nodiscard]] std::string tidyText(std::string_view text, std::size_t maximumBytes = maximumNameBytes);
 
 } // namespace kesto_pipewire

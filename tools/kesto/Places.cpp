@@ -1,26 +1,22 @@
 // One rule for all three directories; they differ in their names only.
 #include "kesto/Places.h"
 
-#include <cstdlib>
+#include "platform/linux/process/Environment.h"
+
 #include <initializer_list>
-#include <string_view>
+#include <string>
 #include <system_error>
 
 namespace fs = std::filesystem;
+using platform::environment;
 
 namespace {
-
-std::string_view environment(const char* name)
-{
-    const char* value = std::getenv(name);
-    return value == nullptr ? "" : value;
-}
 
 // Of the user's directories the first counts that holds that file; an empty name stands for the directory itself.
 fs::path usualDirectory(const char* variable, std::initializer_list<fs::path> ofUser, const fs::path& ofSystem,
                         const fs::path& file = {})
 {
-    if (const std::string_view value = environment(variable); !value.empty())
+    if (const std::string value = environment(variable); !value.empty())
         return fs::absolute(value.substr(0, value.find(':'))); // systemd passes several when a unit has several
     for (const fs::path& directory : ofUser)
         if (std::error_code error; directory.is_absolute() && fs::exists(directory / file, error))

@@ -2,11 +2,12 @@
 #include "channels/ChannelFolder.h"
 
 #include "foundation/values/String.h"
+#include "platform/linux/files/WriteAll.h"
+#include "platform/linux/process/Environment.h"
 
 #include <algorithm>
 #include <cerrno>
 #include <climits>
-#include <cstdlib>
 #include <fcntl.h>
 #include <new>
 #include <span>
@@ -37,13 +38,6 @@ std::expected<std::string, kesto_status> checked(const char* given, std::size_t 
         return std::unexpected(KESTO_INVALID_UTF8);
     std::ranges::replace_if(text, isControl, '_');
     return text;
-}
-
-// Empty when it is not set, or when the program runs with privileges that the user who set it does not have.
-std::string environment(const char* variable)
-{
-    const char* value = ::secure_getenv(variable);
-    return value == nullptr ? "" : value;
 }
 
 FileDescriptor openFolder(int parent, const char* name, int linkFlag)
@@ -85,18 +79,6 @@ void removeIfEmpty(const std::string& root, std::span<const std::string> place)
     }
 }
 
-int writeAll(int file, std::string_view text)
-{
-    while (!text.empty()) {
-        const ssize_t count = ::write(file, text.data(), text.size());
-        if (count >= 0)
-            text.remove_prefix(static_cast<std::size_t>(count));
-        else if (errno != EINTR)
-            return errno;
-    }
-    return 0;
-}
-
 } // namespace
 
 std::expected<std::string, kesto_status> channelFileName(const char* given)
@@ -127,9 +109,9 @@ std::expected<std::string, kesto_status> channelText(const char* given)
 
 std::string usualChannelRoot()
 {
-    if (std::string given = environment("KESTO_CHANNEL_ROOT"); !given.empty())
+    if (std::string given = platform::environment("KESTO_CHANNEL_ROOT"); !given.empty())
         return given;
-    if (const std::string runtime = environment("XDG_RUNTIME_DIR"); !runtime.empty())
+    if (const std::string runtime = platform::environment("XDG_RUNTIME_DIR"); !runtime.empty())
         if (openFolder(AT_FDCWD, (runtime + "/kesto").c_str(), 0))
             return runtime + "/kesto/channels";
     return "/run/kesto/channels";
@@ -179,9 +161,9 @@ int ChannelFolder::write(const std::string& name, std::string_view text) noexcep
                                        O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, filePermissions));
     if (!file)
         return errno;
-    int error = writeAll(file.get(), claim_->line());
+    int error = platform::writeAll(file.get(), claim_->line());
     if (error == 0)
-        error = writeAll(file.get(), text);
+        error = platform::writeAll(file.get(), text);
     if (error == 0 && ::fchmod(file.get(), filePermissions) != 0)
         error = errno;
     if (error == 0 && ::renameat(folder_.get(), temporaryName_.c_str(), folder_.get(), name.c_str()) != 0)

@@ -1,8 +1,9 @@
 // The environment is asked first, then the places where the service is as packaged.
 #include "wire/ServicePath.h"
 
+#include "platform/linux/process/Environment.h"
+
 #include <algorithm>
-#include <cstdlib>
 #include <string_view>
 #include <sys/un.h>
 
@@ -10,13 +11,6 @@ namespace libkesto {
 namespace {
 
 constexpr std::string_view defaultServiceName = "com.quarn.kesto.reporting";
-
-// Empty when it is not set, or when the program runs with privileges that the user who set it does not have.
-std::string environment(const char* variable)
-{
-    const char* value = secure_getenv(variable);
-    return value == nullptr ? "" : value;
-}
 
 bool isSocketPath(const std::string& path)
 {
@@ -34,10 +28,10 @@ std::expected<std::vector<std::string>, kesto_status> servicePaths(const std::st
     std::vector<std::string> paths;
     if (!socketPath.empty()) {
         paths = {socketPath};
-    } else if (const std::string given = environment("KESTO_SOCKET"); !given.empty()) {
+    } else if (const std::string given = platform::environment("KESTO_SOCKET"); !given.empty()) {
         paths = {given};
     } else {
-        if (const std::string runtime = environment("XDG_RUNTIME_DIR"); !runtime.empty())
+        if (const std::string runtime = platform::environment("XDG_RUNTIME_DIR"); !runtime.empty())
             paths.push_back(runtime + "/kesto/" + name);
         paths.push_back("/run/kesto/" + name);
     }

@@ -1,6 +1,7 @@
 // One allocation a string, none for the empty one; and UTF-8 checked eight characters at a time.
 #include "foundation/values/String.h"
 
+#include <algorithm>
 #include <cstdint>
 #include <cstdlib>
 #include <cstring>
@@ -78,6 +79,16 @@ bool isValidUtf8(std::string_view bytes) noexcept
         bytes.remove_prefix(length);
     }
     return true;
+}
+
+void replaceWhatIsNotUtf8(std::string& text) noexcept
+{
+    for (std::size_t at = 0; at < text.size();) {
+        const std::size_t length = sequenceLength(std::string_view(text).substr(at));
+        if (length == 0)
+            text[at] = '?';
+        at += std::max<std::size_t>(1, length);
+    }
 }
 
 } // namespace foundation

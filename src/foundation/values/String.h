@@ -74,4 +74,7 @@ private:
 // U+10FFFF).
 [[nodiscard]] bool isValidUtf8(std::string_view bytes) noexcept;
 
+// Writes a "?" in the place of each byte that is not part of a UTF-8 character. Any thread.
+void replaceWhatIsNotUtf8(std::string& text) noexcept;
+
 } // namespace foundation

@@ -1,7 +1,7 @@
 // A process's name is what is left of it when the kernel and the provider have looked at it.
 #include "support/fakes/FakeSettings.h"
 
-#include "platform/linux/files/Utf8.h"
+#include "foundation/values/String.h"
 
 namespace support {
 
@@ -9,7 +9,7 @@ void FakeProcessTable::add(std::int32_t processIdentifier, std::string name)
 {
     constexpr std::size_t longestName = 15;
     name.resize(std::min(name.size(), longestName));
-    platform::replaceWhatIsNotUtf8(name);
+    foundation::replaceWhatIsNotUtf8(name);
     names_.insert_or_assign(processIdentifier, std::move(name));
 }
 

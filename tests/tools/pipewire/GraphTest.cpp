@@ -445,14 +445,14 @@ TEST_F(GraphTest, ObjectsOfEveryOtherKindHaveTheirLimitToo)
 
 TEST_F(GraphTest, ForeignTextIsMadeFitToBeSent)
 {
-    EXPECT_EQ(add(31, 31, "bad\xFF\xFEname", "Audio/Sink"), Interest::Device);
+    EXPECT_EQ(add(31, 31, "bad\xFF\xFEnäme", "Audio/Sink"), Interest::Device);
     ASSERT_EQ(add(node, 500), Interest::Stream);
     graph.addLink(link, node, 31, now);
     graph.describeNode(node, {.binary = std::string(10'000, 'x')}, "", now);
     const auto heard = listener.news();
 
     EXPECT_EQ(heard[0], "500 appeared output role= application=" + std::string(255, 'x'));
-    EXPECT_EQ(heard[1], "500 devices 'bad??name'");
+    EXPECT_EQ(heard[1], "500 devices 'bad??näme'");
 }
 
 TEST_F(GraphTest, TextIsNeverCutWithinACharacter)

@@ -4,9 +4,6 @@
 #include <filesystem>
 #include <string_view>
 
-// Writes all of it; false, with errno set, when that fails.
-[[nodiscard]] bool writeAll(int file, std::string_view text);
-
 // Writes the text to the path, into what stands there already: a device and a pipe stay what they are. Throws
 // std::runtime_error, which names the path.
 void writeOutput(const std::filesystem::path& path, std::string_view text);

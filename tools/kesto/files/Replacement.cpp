@@ -1,8 +1,8 @@
 // The new file lies on the disk as a whole before it takes the name, so that losing power leaves one or the other.
 #include "kesto/files/Replacement.h"
 
-#include "kesto/files/OutputFile.h"
 #include "platform/linux/files/FileDescriptor.h"
+#include "platform/linux/files/WriteAll.h"
 
 #include <cerrno>
 #include <cstdlib>
@@ -18,7 +18,7 @@ namespace fs = std::filesystem;
 
 namespace {
 
-std::runtime_error systemError(std::string_view what, const fs::path& path, int error)
+std::runtime_error failure(std::string_view what, const fs::path& path, int error)
 {
     return std::runtime_error(
         fmt::format("cannot {} {}: {}", what, path.native(), std::generic_category().message(error)));
@@ -41,16 +41,17 @@ void replaceFile(const fs::path& path, std::string_view text)
     std::string temporary = path.parent_path() / ".kesto-XXXXXX";
     platform::FileDescriptor file(::mkostemp(temporary.data(), O_CLOEXEC));
     if (!file)
-        throw systemError("write", path, errno);
-    const bool isWritten = (isThere ? takeOver(file.get(), before) : ::fchmod(file.get(), readableByAll) == 0)
-        && writeAll(file.get(), text) && ::fsync(file.get()) == 0;
-    int error = isWritten ? 0 : errno;
+        throw failure("write", path, errno);
+    const bool isReady = isThere ? takeOver(file.get(), before) : ::fchmod(file.get(), readableByAll) == 0;
+    int error = isReady ? platform::writeAll(file.get(), text) : errno;
+    if (error == 0 && ::fsync(file.get()) != 0)
+        error = errno;
     file = {}; // who watches the directory is told when a file is closed, too: that shall not be in its place already
     if (error == 0 && ::rename(temporary.c_str(), path.c_str()) == 0)
         return;
     error = error == 0 ? errno : error;
     ::unlink(temporary.c_str());
-    throw systemError("write", path, error);
+    throw failure("write", path, error);
 }
 
 void makeDirectory(const fs::path& path)
@@ -58,5 +59,5 @@ void makeDirectory(const fs::path& path)
     constexpr mode_t readableByAll = 0755;
     const bool isMade = ::mkdir(path.c_str(), readableByAll) == 0;
     if (isMade ? ::chmod(path.c_str(), readableByAll) != 0 : errno != EEXIST)
-        throw systemError("make", path, errno);
+        throw failure("make", path, errno);
 }

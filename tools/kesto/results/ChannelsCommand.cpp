@@ -7,12 +7,12 @@
 #include "platform/linux/channels/ChannelDifference.h"
 #include "platform/linux/channels/ChannelTree.h"
 #include "platform/linux/channels/SoundCards.h"
+#include "platform/linux/process/Environment.h"
 
 #include <algorithm>
 #include <array>
 #include <chrono>
 #include <cstdio>
-#include <cstdlib>
 #include <fmt/format.h>
 #include <iterator>
 #include <memory>
@@ -38,8 +38,8 @@ struct ChannelsOptions {
 
 std::filesystem::path usualRoot()
 {
-    const char* given = std::getenv("KESTO_CHANNEL_ROOT");
-    return given != nullptr && *given != '\0' ? std::filesystem::path(given) : usualRuntimeDirectory() / "channels";
+    const std::string given = platform::environment("KESTO_CHANNEL_ROOT");
+    return given.empty() ? usualRuntimeDirectory() / "channels" : std::filesystem::path(given);
 }
 
 // --- what a channel holds

@@ -4,6 +4,7 @@
 
 #include "platform/linux/files/FilesAt.h"
 #include "platform/linux/files/OldestFirst.h"
+#include "platform/linux/files/SystemError.h"
 
 #include <algorithm>
 #include <array>
@@ -28,11 +29,6 @@ constexpr const char* stateName = "state";
 constexpr mode_t permissions = 0750; // of folders: what a capture holds is for the service's group
 
 constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
-
-std::error_code lastError()
-{
-    return {errno, std::generic_category()};
-}
 
 // Hidden names are those of folders that are coming or going.
 constexpr std::string_view coming = ".new";
@@ -75,7 +71,7 @@ void remove(int directory, const std::string& name, int folder)
 
 std::error_code syncDirectory(int directory)
 {
-    return ::fsync(directory) == 0 ? std::error_code() : lastError();
+    return ::fsync(directory) == 0 ? std::error_code() : systemError();
 }
 
 std::error_code writeAll(int directory, const std::vector<BugCaptureFolder::File>& files)
@@ -89,7 +85,7 @@ std::error_code writeAll(int directory, const std::vector<BugCaptureFolder::File
 std::expected<FileDescriptor, std::error_code> makeDirectoryAt(int directory, const std::string& name)
 {
     if (::mkdirat(directory, name.c_str(), permissions) != 0)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     return openDirectoryAt(directory, name);
 }
 
@@ -116,7 +112,7 @@ std::expected<FileDescriptor, std::error_code> BugCaptureFolder::openStateDirect
 {
     FileDescriptor opened(::open(stateDirectory_.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!opened)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     return opened;
 }
 
@@ -132,7 +128,7 @@ std::expected<FileDescriptor, std::error_code> BugCaptureFolder::openOrMake() co
     if (folder || folder.error() != std::errc::no_such_file_or_directory)
         return folder;
     if (::mkdir(path_.c_str(), permissions) != 0)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     return open();
 }
 
@@ -147,7 +143,7 @@ std::error_code BugCaptureFolder::checkFreeSpace() const
 {
     struct statvfs status = {};
     if (::statvfs(stateDirectory_.c_str(), &status) != 0)
-        return lastError();
+        return systemError();
     const auto free = std::uint64_t{status.f_bavail} * status.f_frsize;
     return free < limits_.bytesLeftFree ? make_error_code(std::errc::no_space_on_device) : std::error_code();
 }
@@ -190,7 +186,7 @@ std::error_code BugCaptureFolder::keepLastNumber(std::uint64_t number) const
         return error;
     if (::renameat(parent->get(), unfinished.c_str(), parent->get(), lastNumberName) == 0)
         return syncDirectory(parent->get());
-    const auto error = lastError();
+    const auto error = systemError();
     removeTreeAt(parent->get(), unfinished);
     return error;
 }
@@ -265,7 +261,7 @@ std::error_code BugCaptureFolder::add(const std::string& name, const std::vector
     if (!error)
         error = keepLastNumber(std::max(numberOf(name), lastNumber()));
     if (!error && ::renameat(folder->get(), hidden.c_str(), folder->get(), name.c_str()) != 0)
-        error = lastError();
+        error = systemError();
     if (error)
         removeTreeAt(folder->get(), hidden);
     else

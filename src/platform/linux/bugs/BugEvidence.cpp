@@ -2,8 +2,8 @@
 // chose to call themselves.
 #include "platform/linux/bugs/BugEvidence.h"
 
+#include "foundation/values/String.h"
 #include "platform/linux/files/FilesAt.h"
-#include "platform/linux/files/Utf8.h"
 
 #include <algorithm>
 #include <array>
@@ -28,7 +28,7 @@ constexpr std::size_t mostNames = std::size_t{1} << 20; // in a folder of the ke
 // The parts that end with such a byte, as text; a last one without it counts too.
 Array partsOf(std::string bytes, char end)
 {
-    replaceWhatIsNotUtf8(bytes);
+    foundation::replaceWhatIsNotUtf8(bytes);
     std::vector<Value> parts;
     for (std::string_view rest = bytes; !rest.empty();) {
         const std::size_t length = rest.find(end);
@@ -45,7 +45,7 @@ std::optional<std::string> nameOf(int process)
         return std::nullopt;
     if (name->ends_with('\n'))
         name->pop_back();
-    replaceWhatIsNotUtf8(*name);
+    foundation::replaceWhatIsNotUtf8(*name);
     return *std::move(name);
 }
 
@@ -91,7 +91,7 @@ public:
             } else if (auto bytes = readFileAt(folder, name, std::min(limits_.longestSoundFile, bytesLeft_))) {
                 bytesLeft_ -= bytes->size();
                 std::string path = prefix + name;
-                replaceWhatIsNotUtf8(path);
+                foundation::replaceWhatIsNotUtf8(path);
                 files_.push_back({foundation::String(path), partsOf(*std::move(bytes), '\n')});
             }
         }

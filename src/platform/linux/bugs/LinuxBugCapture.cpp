@@ -4,7 +4,7 @@
 
 #include "foundation/text/PrettyJsonWriter.h"
 #include "platform/linux/bugs/BugEvidence.h"
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 
 #include <algorithm>
 #include <fmt/format.h>

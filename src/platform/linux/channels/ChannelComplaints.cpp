@@ -1,7 +1,7 @@
 // Problems are kept sorted, so that to look one up is cheap however many there are.
 #include "platform/linux/channels/ChannelComplaints.h"
 
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 
 #include <algorithm>
 #include <utility>

@@ -7,7 +7,7 @@
 #include "platform/linux/channels/ChannelFile.h"
 #include "platform/linux/channels/ChannelOwner.h"
 #include "platform/linux/files/FileDescriptor.h"
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 
 #include <algorithm>
 #include <array>

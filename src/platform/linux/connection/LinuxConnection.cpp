@@ -3,7 +3,7 @@
 #include "platform/linux/connection/LinuxConnection.h"
 
 #include "platform/linux/connection/Outbox.h"
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 #include "platform/linux/queues/SerialQueue.h"
 
 #include <array>

@@ -2,7 +2,7 @@
 // neither many new clients nor too many take anything from those that are there.
 #include "platform/linux/connection/LinuxConnectionListener.h"
 
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 #include "platform/linux/queues/SerialQueue.h"
 #include "platform/linux/queues/ThreadHeap.h"
 
@@ -21,11 +21,6 @@ namespace {
 
 constexpr int mostAcceptedAtOnce = 16; // so that the clients which are there get their turn
 constexpr std::size_t mostEventsAtOnce = 64;
-
-std::error_code systemError()
-{
-    return {errno, std::generic_category()};
-}
 
 std::size_t mostConnections()
 {

@@ -2,7 +2,7 @@
 // one, and one that runs must not lose its own.
 #include "platform/linux/connection/ListeningSocket.h"
 
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 
 #include <cerrno>
 #include <cstring>

@@ -5,6 +5,8 @@
 #include "platform/linux/diagnostics/FolderKeeper.h"
 #include "platform/linux/files/FilesAt.h"
 #include "platform/linux/files/SmallFile.h"
+#include "platform/linux/files/SystemError.h"
+#include "platform/linux/files/WriteAll.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -14,11 +16,6 @@
 
 namespace platform {
 namespace {
-
-std::error_code lastError()
-{
-    return {errno, std::generic_category()};
-}
 
 class LinuxAtomicFile final : public AtomicFile {
 public:
@@ -39,25 +36,20 @@ public:
 
     void write(std::string_view text) override
     {
-        while (!text.empty() && !error_) {
-            const ssize_t count = ::write(file_.get(), text.data(), text.size());
-            if (count >= 0)
-                text.remove_prefix(static_cast<std::size_t>(count));
-            else if (errno != EINTR)
-                error_ = lastError();
-        }
+        if (!error_)
+            error_.assign(writeAll(file_.get(), text), std::generic_category());
     }
 
     void clear() override
     {
         if (!error_ && (::ftruncate(file_.get(), 0) != 0 || ::lseek(file_.get(), 0, SEEK_SET) != 0))
-            error_ = lastError();
+            error_ = systemError();
     }
 
     std::expected<void, std::error_code> commit() override
     {
         if (!error_ && ::renameat(directory_.get(), temporaryName_.c_str(), directory_.get(), name_.c_str()) != 0)
-            error_ = lastError();
+            error_ = systemError();
         isCommitted_ = !error_;
         if (error_)
             return std::unexpected(error_);
@@ -77,9 +69,9 @@ private:
 std::error_code makeIfMissing(int parent, const char* name, unsigned permissions)
 {
     if (::mkdirat(parent, name, permissions) != 0)
-        return errno == EEXIST ? std::error_code() : lastError();
+        return errno == EEXIST ? std::error_code() : systemError();
     // The umask took its part, and is the process's and not to be touched.
-    return ::fchmodat(parent, name, permissions, AT_SYMLINK_NOFOLLOW) == 0 ? std::error_code() : lastError();
+    return ::fchmodat(parent, name, permissions, AT_SYMLINK_NOFOLLOW) == 0 ? std::error_code() : systemError();
 }
 
 std::optional<unsigned> permissionsOf(const std::filesystem::path& folder)
@@ -127,14 +119,14 @@ LinuxFileSystem::openDirectory(const std::filesystem::path& path, std::optional<
         directory = openRoot();
     }
     if (!directory)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     for (const std::filesystem::path& name : below) {
         if (permissionsOfMissing)
             if (const auto error = makeIfMissing(directory.get(), name.c_str(), *permissionsOfMissing))
                 return std::unexpected(error);
         FileDescriptor next(::openat(directory.get(), name.c_str(), O_PATH | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
         if (!next)
-            return std::unexpected(lastError());
+            return std::unexpected(systemError());
         directory = std::move(next);
     }
     return directory;
@@ -159,7 +151,7 @@ LinuxFileSystem::createAtomically(const std::filesystem::path& path)
     FileDescriptor file(
         ::openat(directory->get(), name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByAll));
     if (!file || ::fchmod(file.get(), readableByAll) != 0) // the umask took its part, as it does of folders
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     return std::make_unique<LinuxAtomicFile>(*std::move(directory), std::move(file), std::move(name),
                                              path.filename().string());
 }
@@ -186,7 +178,7 @@ std::expected<std::string, std::error_code> LinuxFileSystem::readFile(const std:
     const FileDescriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
     struct stat status = {};
     if (!place || ::fstat(place.get(), &status) != 0)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     if (!S_ISREG(status.st_mode))
         return notAFile;
     return readSmallFile(foundation::format("/proc/self/fd/{}", place.get()), limit);

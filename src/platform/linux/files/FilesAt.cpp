@@ -1,6 +1,9 @@
 // Thin over the kernel's *at calls: that none of them ever follows a link is what this file is for.
 #include "platform/linux/files/FilesAt.h"
 
+#include "platform/linux/files/SystemError.h"
+#include "platform/linux/files/WriteAll.h"
+
 #include <algorithm>
 #include <cerrno>
 #include <dirent.h>
@@ -19,11 +22,6 @@ constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
 constexpr unsigned deepestTree = 8; // that is removed; none of ours is deeper
 constexpr std::string_view temporaryBegin = ".kestod-";
 constexpr std::string_view temporaryEnd = ".tmp";
-
-std::error_code lastError()
-{
-    return {errno, std::generic_category()};
-}
 
 struct CloseDirectory {
     void operator()(DIR* directory) const { ::closedir(directory); }
@@ -49,7 +47,7 @@ std::expected<FileDescriptor, std::error_code> openDirectoryAt(int directory, co
 {
     FileDescriptor opened(::openat(directory, name.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC));
     if (!opened)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     return opened;
 }
 
@@ -58,10 +56,10 @@ std::expected<std::vector<std::string>, std::error_code> namesIn(int directory, 
     // A descriptor of its own, since reading moves its place in the folder.
     const int own = ::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     if (own < 0)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     const std::unique_ptr<DIR, CloseDirectory> stream(::fdopendir(own));
     if (!stream) {
-        const auto error = lastError();
+        const auto error = systemError();
         ::close(own);
         return std::unexpected(error);
     }
@@ -79,7 +77,7 @@ std::expected<std::string, std::error_code> readFileAt(int directory, const std:
         ::openat(directory, name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0)
-        return std::unexpected(lastError());
+        return std::unexpected(systemError());
     if (!S_ISREG(status.st_mode))
         return std::unexpected(make_error_code(std::errc::invalid_argument));
     constexpr std::size_t piece = 4096; // files of /proc have no size: only the end tells the length
@@ -91,7 +89,7 @@ std::expected<std::string, std::error_code> readFileAt(int directory, const std:
         if (count < 0 && errno == EINTR)
             continue;
         if (count < 0)
-            return std::unexpected(lastError());
+            return std::unexpected(systemError());
         if (count == 0)
             break;
         length += static_cast<std::size_t>(count);
@@ -122,16 +120,10 @@ std::error_code writeFileAt(int directory, const std::string& name, std::string_
     const FileDescriptor file(
         ::openat(directory, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByGroup));
     if (!file)
-        return lastError();
-    while (!bytes.empty()) {
-        const ssize_t count = ::write(file.get(), bytes.data(), bytes.size());
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count < 0)
-            return lastError();
-        bytes.remove_prefix(static_cast<std::size_t>(count));
-    }
-    return ::fsync(file.get()) == 0 ? std::error_code() : lastError();
+        return systemError();
+    if (const int error = writeAll(file.get(), bytes); error != 0)
+        return {error, std::generic_category()};
+    return ::fsync(file.get()) == 0 ? std::error_code() : systemError();
 }
 
 std::uint64_t bytesOfFilesIn(int directory)

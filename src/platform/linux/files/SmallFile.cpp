@@ -2,6 +2,7 @@
 #include "platform/linux/files/SmallFile.h"
 
 #include "platform/linux/files/FileDescriptor.h"
+#include "platform/linux/files/SystemError.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -9,21 +10,13 @@
 #include <sys/stat.h>
 
 namespace platform {
-namespace {
-
-std::unexpected<std::error_code> systemError()
-{
-    return std::unexpected(std::error_code(errno, std::generic_category()));
-}
-
-} // namespace
 
 std::expected<std::string, std::error_code> readSmallFile(const std::filesystem::path& path, std::size_t limit)
 {
     const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NOCTTY | O_NONBLOCK));
     struct stat status = {};
     if (!file || ::fstat(file.get(), &status) != 0)
-        return systemError();
+        return std::unexpected(systemError());
     if (!S_ISREG(status.st_mode))
         return std::unexpected(make_error_code(std::errc::invalid_argument));
 
@@ -35,7 +28,7 @@ std::expected<std::string, std::error_code> readSmallFile(const std::filesystem:
             std::min(limit + 1, length + std::max(smallestRead, static_cast<std::size_t>(status.st_size) + 1)));
         const ssize_t count = ::read(file.get(), bytes.data() + length, bytes.size() - length);
         if (count < 0 && errno != EINTR)
-            return systemError();
+            return std::unexpected(systemError());
         length += static_cast<std::size_t>(std::max<ssize_t>(count, 0));
         if (length > limit)
             return std::unexpected(make_error_code(std::errc::file_too_large));

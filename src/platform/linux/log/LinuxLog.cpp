@@ -2,7 +2,8 @@
 // capture all say the same.
 #include "platform/linux/log/LinuxLog.h"
 
-#include "platform/linux/files/Utf8.h"
+#include "foundation/values/String.h"
+#include "platform/linux/files/WriteAll.h"
 #include "platform/linux/log/ProviderLog.h"
 #include "platform/linux/process/LinuxClock.h"
 
@@ -66,7 +67,7 @@ void appendEscaped(std::string_view text, Buffer& out)
 void appendLine(const LogRecord& record, Buffer& out)
 {
     out.append(logPrefix(record.location));
-    const std::string_view message = cutBetweenCharacters(record.message, LinuxLog::longestMessage);
+    const std::string_view message = foundation::cutBetweenCharacters(record.message, LinuxLog::longestMessage);
     appendEscaped(message, out);
     if (message.size() < record.message.size())
         fmt::format_to(std::back_inserter(out), "... ({} bytes more)", record.message.size() - message.size());
@@ -148,14 +149,7 @@ void LinuxLog::reportLost()
 
 void LinuxLog::writeToDescriptor(std::string_view line) const
 {
-    while (!line.empty()) {
-        const ssize_t written = ::write(descriptor_, line.data(), line.size());
-        if (written < 0 && errno == EINTR)
-            continue;
-        if (written <= 0)
-            return; // there is nowhere left to tell it
-        line.remove_prefix(static_cast<std::size_t>(written));
-    }
+    static_cast<void>(writeAll(descriptor_, line)); // there is nowhere left to say that it failed
 }
 
 } // namespace platform

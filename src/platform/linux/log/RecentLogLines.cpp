@@ -2,7 +2,7 @@
 #include "platform/linux/log/RecentLogLines.h"
 
 #include "foundation/text/LocalTime.h"
-#include "platform/linux/files/Utf8.h"
+#include "foundation/values/String.h"
 
 #include <cmath>
 #include <fmt/format.h>
@@ -12,7 +12,7 @@ namespace platform {
 
 void RecentLogLines::add(double time, LogLevel level, std::string_view tag, std::string_view line)
 {
-    std::string text(cutBetweenCharacters(line, longestLine));
+    std::string text(foundation::cutBetweenCharacters(line, longestLine));
     const foundation::Lock lock(lock_);
     bytes_ += text.size();
     lines_.push_back({time, level, tag, std::move(text)});

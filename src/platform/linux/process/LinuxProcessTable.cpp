@@ -2,8 +2,8 @@
 // keep in order, and nothing that clients can make grow.
 #include "platform/linux/process/LinuxProcessTable.h"
 
+#include "foundation/values/String.h"
 #include "platform/linux/files/SmallFile.h"
-#include "platform/linux/files/Utf8.h"
 
 #include <cerrno>
 #include <ctime>
@@ -24,7 +24,7 @@ std::optional<std::string> readName(std::string_view process)
     if (name->ends_with('\n'))
         name->pop_back();
     // A process names itself, in any bytes; the kernel cuts the name, be it inside a character.
-    replaceWhatIsNotUtf8(*name);
+    foundation::replaceWhatIsNotUtf8(*name);
     return std::move(*name);
 }
 

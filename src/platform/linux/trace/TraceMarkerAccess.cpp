@@ -2,6 +2,7 @@
 // everybody who comes later. Nobody is answered under the lock.
 #include "platform/linux/trace/TraceMarkerAccess.h"
 
+#include "platform/linux/files/SystemError.h"
 #include "platform/linux/trace/TraceMarker.h"
 
 #include <atomic>
@@ -13,11 +14,6 @@
 
 namespace platform {
 namespace {
-
-std::error_code systemError()
-{
-    return {errno, std::generic_category()};
-}
 
 } // namespace
 

@@ -4,7 +4,7 @@
 
 #include "platform/linux/files/FilesAt.h"
 #include "platform/linux/files/SmallFile.h"
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -2,7 +2,7 @@
 // are handed to the sessions' own queues.
 #include "platform/linux/trace/TracefsKernelTrace.h"
 
-#include "platform/linux/files/SystemErrorText.h"
+#include "platform/linux/files/SystemError.h"
 #include "platform/linux/process/Thread.h"
 
 #include <algorithm>

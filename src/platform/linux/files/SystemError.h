@@ -1,10 +1,18 @@
-// What the system's error numbers mean, in the same words whatever the locale.
+// The system's error numbers: as errors to hand on, and what they mean, in the same words whatever the locale.
 #pragma once
 
+#include <cerrno>
 #include <cstring>
 #include <string_view>
+#include <system_error>
 
 namespace platform {
+
+// Of the call that failed last on this thread. Any thread.
+[[nodiscard]] inline std::error_code systemError() noexcept
+{
+    return {errno, std::generic_category()};
+}
 
 // Such as "Connection reset by peer" for ECONNRESET. Any thread.
 [[nodiscard]] inline std::string_view systemErrorText(int error) noexcept
