@@ -2,14 +2,14 @@
 // none.
 #include "platform/linux/connection/LinuxConnection.h"
 
+#include "foundation/cbor/Cbor.h"
+#include "platform/linux/connection/FrameReader.h"
 #include "platform/linux/connection/Outbox.h"
 #include "platform/linux/files/SystemError.h"
 #include "platform/linux/queues/SerialQueue.h"
 
-#include <array>
 #include <cassert>
 #include <cerrno>
-#include <cstring>
 #include <fmt/format.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
@@ -31,25 +31,6 @@ bool asksForTraceMarker(const foundation::Array& frame)
         return false;
     const auto method = frame[1].string();
     return method && method->view() == "trace";
-}
-
-// Sends what the socket takes, and the descriptors with the first byte.
-ssize_t sendWithDescriptors(int socket, std::string_view bytes, const TraceDescriptors& descriptors)
-{
-    const std::array numbers{descriptors.marker, descriptors.page};
-    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof numbers)> control{};
-    iovec part = {const_cast<char*>(bytes.data()), bytes.size()};
-    msghdr message = {};
-    message.msg_iov = &part;
-    message.msg_iovlen = 1;
-    message.msg_control = control.data();
-    message.msg_controllen = control.size();
-    cmsghdr* const head = CMSG_FIRSTHDR(&message);
-    head->cmsg_level = SOL_SOCKET;
-    head->cmsg_type = SCM_RIGHTS;
-    head->cmsg_len = CMSG_LEN(sizeof numbers);
-    std::memcpy(CMSG_DATA(head), numbers.data(), sizeof numbers);
-    return ::sendmsg(socket, &message, MSG_DONTWAIT | MSG_NOSIGNAL);
 }
 
 constexpr bool areTooManyUnanswered(std::uint64_t unanswered) noexcept
@@ -155,7 +136,7 @@ void LinuxConnection::read()
 
 void LinuxConnection::endOfStream()
 {
-    if (reader_.isInsideFrame())
+    if (input_.isInsideFrame())
         breakOff("the stream ends inside a frame");
     else
         peerIsDone_ = true;
@@ -165,7 +146,7 @@ void LinuxConnection::endOfStream()
 // calls go to wakes up once and finds them all.
 void LinuxConnection::takeIn(std::string_view bytes)
 {
-    reader_.feed(bytes);
+    input_.feed(bytes);
     const auto decoded = decodeFrames();
     const auto delivered = deliverCalls();
     if (!delivered)
@@ -177,26 +158,20 @@ void LinuxConnection::takeIn(std::string_view bytes)
 std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
 {
     while (true) {
-        const auto frame = reader_.next();
+        auto frame = input_.next();
         if (!frame)
-            return std::unexpected(Violation{fmt::format("a frame is longer than {} bytes", longestFrame)});
+            return std::unexpected(std::move(frame).error());
         if (!*frame)
             return {};
-        const auto value = decoder_.decode(**frame);
-        if (!value)
-            return std::unexpected(Violation{std::string(foundation::description(value.error()))});
-        auto array = value->array();
-        if (!array)
-            return std::unexpected(Violation{"a frame is not an array"});
-        if (asksForTraceMarker(*array)) {
-            if (auto asked = askForTraceMarker((*array)[0]); !asked)
+        auto& [array, size] = **frame;
+        if (asksForTraceMarker(array)) {
+            if (auto asked = askForTraceMarker(array[0]); !asked)
                 return asked;
             continue;
         }
-        const std::size_t size = (*frame)->size();
         unanswered_.fetch_add(unansweredCall(size));
         std::shared_ptr<Connection> caller(std::make_shared<Credit>(shared_from_this(), size), this);
-        hub_->calls.push_back({*std::move(array), std::move(caller)});
+        hub_->calls.push_back({std::move(array), std::move(caller)});
     }
 }
 
@@ -240,9 +215,10 @@ void LinuxConnection::handOver(std::uint64_t call, const TraceDescriptors& descr
     const foundation::Lock lock(lock_);
     if (isOver_ || breakReason_ || cannotSend_)
         return;
-    handOver_ = {output_.size(), descriptors};
-    appendFrame(frame, output_);
-    unsentBytes_ += frameHeadSize + frame.size();
+    std::string whole;
+    appendFrame(frame, whole);
+    unsentBytes_ += whole.size();
+    output_.append(std::move(whole), descriptors);
     writeOutput();
 }
 
@@ -279,11 +255,11 @@ void LinuxConnection::write(std::string frames)
     if (isOver_ || breakReason_ || cannotSend_) {
         drop(frames.size());
         watch(); // it is less behind now, and may still be read from
-    } else if (!output_.empty()) {
-        output_ += frames; // behind what waits for room already
+    } else if (!output_.empty()) { // the socket has no room: the connection thread goes on when it has
+        output_.append(std::move(frames));
         watch();
     } else {
-        output_ = std::move(frames);
+        output_.append(std::move(frames));
         writeOutput();
     }
 }
@@ -293,49 +269,13 @@ void LinuxConnection::writeOutput()
 {
     if (isOver_ || output_.empty())
         return;
-    const ssize_t count = sendOutput();
-    if (count >= 0) {
-        unsentBytes_ -= static_cast<std::size_t>(count);
-        outputStart_ += static_cast<std::size_t>(count);
-    } else if (errno != EAGAIN && errno != EINTR) { // reading goes on: what the peer sent before is still there
+    if (const auto taken = output_.writeTo(socket_.get())) {
+        unsentBytes_ -= *taken;
+    } else { // reading goes on: what the peer sent before is still there
         cannotSend_ = true;
-        dropOutput();
-    }
-    if (outputStart_ == output_.size()) {
-        std::string().swap(output_); // rather than clear: an idle connection keeps no buffer
-        outputStart_ = 0;
-    } else if (outputStart_ > output_.size() / 2) { // so that moving costs less than sending did
-        output_.erase(0, outputStart_);
-        if (handOver_)
-            handOver_->place -= outputStart_;
-        outputStart_ = 0;
+        drop(output_.drop());
     }
     watch();
-}
-
-// Descriptors go with the first byte of their frame. When the system has none to spare, because clients do not take
-// theirs, the frame goes without.
-ssize_t LinuxConnection::sendOutput()
-{
-    std::string_view rest = std::string_view(output_).substr(outputStart_);
-    if (handOver_ && handOver_->place == outputStart_) {
-        const ssize_t count = sendWithDescriptors(socket_.get(), rest, handOver_->descriptors);
-        if (count > 0 || errno == ETOOMANYREFS)
-            handOver_.reset();
-        if (count > 0 || handOver_)
-            return count;
-    } else if (handOver_) {
-        rest = rest.substr(0, handOver_->place - outputStart_);
-    }
-    return ::send(socket_.get(), rest.data(), rest.size(), MSG_DONTWAIT | MSG_NOSIGNAL);
-}
-
-void LinuxConnection::dropOutput()
-{
-    drop(output_.size() - outputStart_);
-    std::string().swap(output_);
-    outputStart_ = 0;
-    handOver_.reset();
 }
 
 void LinuxConnection::drop(std::size_t bytes)
@@ -392,7 +332,7 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
         if (isOver_)
             return;
         isOver_ = true;
-        dropOutput();
+        drop(output_.drop());
         readingPauses = readingPauses_;
         if (isResumed_) // closing does not suffice when a child process happens to hold a copy
             ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_DEL, socket_.get(), nullptr);

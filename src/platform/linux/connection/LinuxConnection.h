@@ -10,10 +10,10 @@
 #pragma once
 
 #include "foundation/Mutex.h"
-#include "foundation/cbor/Cbor.h"
 #include "platform/Connection.h"
 #include "platform/linux/connection/ConnectionHub.h"
-#include "platform/linux/connection/FrameReader.h"
+#include "platform/linux/connection/ConnectionInput.h"
+#include "platform/linux/connection/ConnectionOutput.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/trace/TraceMarkerAccess.h"
 
@@ -65,10 +65,6 @@ public:
 
 private:
     class Credit;
-    struct HandOver {
-        std::size_t place; // in the output, where the frame begins that they go with
-        TraceDescriptors descriptors;
-    };
 
     [[nodiscard]] bool isBrokenOff();
     [[nodiscard]] bool settle();
@@ -86,8 +82,6 @@ private:
     [[nodiscard]] bool isBehind() const noexcept;
     void drop(std::size_t bytes);
     void writeOutput() KESTO_REQUIRES(lock_);
-    [[nodiscard]] ssize_t sendOutput() KESTO_REQUIRES(lock_);
-    void dropOutput() KESTO_REQUIRES(lock_);
     void watch() KESTO_REQUIRES(lock_);
 
     const std::shared_ptr<ConnectionHub> hub_;
@@ -97,8 +91,7 @@ private:
     CallHandler callHandler_;
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;
-    FrameReader reader_;
-    foundation::CborDecoder decoder_;
+    ConnectionInput input_;
     bool peerIsDone_ = false; // it closed its side, between two frames
     bool hasAskedForTraceMarker_ = false;
 
@@ -109,9 +102,7 @@ private:
 
     foundation::Mutex lock_;
     FileDescriptor socket_; // read from without the lock, for only the connection thread closes it, under the lock
-    std::string output_ KESTO_GUARDED_BY(lock_); // what the socket did not take yet, from `outputStart_` on
-    std::size_t outputStart_ KESTO_GUARDED_BY(lock_) = 0;
-    std::optional<HandOver> handOver_ KESTO_GUARDED_BY(lock_);
+    ConnectionOutput output_ KESTO_GUARDED_BY(lock_); // what the socket did not take yet
     std::uint32_t watchedEvents_ KESTO_GUARDED_BY(lock_) = 0;
     std::uint64_t readingPauses_ KESTO_GUARDED_BY(lock_) = 0;
     std::optional<std::string> breakReason_ KESTO_GUARDED_BY(lock_);
