@@ -93,9 +93,10 @@ public:
                                   AudioEventType type, AudioServiceType serviceType,
                                   const foundation::Dictionary& userInfo, const KestoReportingReply& reply);
 
-    // What the volume analysis does with bursts, of whole payloads and for any keys: the payloads of the messages in
-    // order, those that carry any of the keys folded together: one that comes no
-    // more than the pause (seconds) after the one before joins it, at the place of the first of them.
+    // The payloads of the messages in order, those that carry any of the keys folded together: one that comes no more
+    // than the pause (seconds) after the one before joins it, at the place of the first of them. This is the
+    // definition; the volume analysis folds only the entries that it reads. The properties `RapidMessages` and
+    // `VolumeMessagesOfAnyStore` bind both to one description of it.
     [[nodiscard]] static std::vector<foundation::Dictionary>
     combineRapidMessages(const KestoReportingMessageStore& messages, std::span<const std::string_view> keysToCombine,
                          double maximumPausetime);

@@ -48,6 +48,9 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 // What the dictionary holds as the host application, or "Unknown".
 [[nodiscard]] foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Dictionary& dictionary);
 
+// The next three are the definition of what is done to a message; sessions call the one behind them, which the property
+// `NormalisedMessage.IsWhatTheThreeStepsMakeOfIt` binds to them.
+//
 // The payload with "audiotag" set to the names of its category and type, such as "PlaybackStart".
 [[nodiscard]] foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation::Dictionary& message,
                                                                              AudioEventCategory category,
@@ -57,6 +60,7 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 // The payload with "_" for every blank in its keys; of keys that become equal the last one's value stays.
 [[nodiscard]] foundation::Dictionary
 KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message);
+
 // These three one after the other, blanks first and the time stamp last, at the cost of one.
 [[nodiscard]] foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::Dictionary& message,
                                                                            AudioEventCategory category,

@@ -2,27 +2,13 @@
 #pragma once
 
 #include "session/KestoReportingMessageStore.h"
+#include "support/PrintValues.h"
 
 #include <gtest/gtest.h>
 #include <memory>
-#include <ostream>
 #include <string>
 #include <utility>
 #include <vector>
-
-namespace foundation {
-
-// How failures show dictionaries.
-inline void PrintTo(const Dictionary& dictionary, std::ostream* out)
-{
-    *out << Value(dictionary).text();
-}
-inline void showValue(const Dictionary& dictionary, std::ostream& out)
-{
-    out << Value(dictionary).text();
-}
-
-} // namespace foundation
 
 using Messages = std::vector<foundation::Dictionary>;
 

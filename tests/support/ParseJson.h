@@ -2,6 +2,7 @@
 #pragma once
 
 #include "foundation/values/Value.h"
+#include "support/PrintValues.h"
 
 #include <optional>
 #include <rapidjson/memorystream.h>

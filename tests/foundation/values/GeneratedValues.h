@@ -2,24 +2,10 @@
 #pragma once
 
 #include "foundation/values/Value.h"
+#include "support/PrintValues.h"
 
-#include <ostream>
 #include <rapidcheck.h>
 #include <string>
-
-namespace foundation {
-
-// How failures show values.
-inline void PrintTo(const Value& value, std::ostream* out)
-{
-    *out << value.text();
-}
-inline void showValue(const Value& value, std::ostream& out)
-{
-    out << value.text();
-}
-
-} // namespace foundation
 
 namespace generated {
 

@@ -269,6 +269,11 @@ protected:
         EXPECT_TRUE(progress.waitFor([&] { return records.size() > number; }));
         return {std::move(peer), progress.look([&] { return records.at(number); })};
     }
+    std::pair<std::unique_ptr<Peer>, std::shared_ptr<Record>> listenAndConnect()
+    {
+        listen();
+        return connect();
+    }
     [[nodiscard]] std::vector<std::string> historyOnceItHas(std::size_t length, Record& record)
     {
         subject->work();
@@ -325,8 +330,7 @@ KESTO_CONTRACT(ConnectionContract, (provider<ConnectionSubject, FakeConnectionSu
 
 TEST_P(ConnectionContract, TellsWhoIsAtTheOtherEndAlsoWhenItIsOver)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     EXPECT_EQ(record->connection->processIdentifier(), subject->peerProcess());
     const std::string description = record->connection->description();
     EXPECT_THAT(description, testing::HasSubstr(std::to_string(subject->peerProcess())));
@@ -339,8 +343,7 @@ TEST_P(ConnectionContract, TellsWhoIsAtTheOtherEndAlsoWhenItIsOver)
 TEST_P(ConnectionContract, DeliversCallsInTheirOrderWithWhoMadeThem)
 {
     const Array whole{3, foundation::Dictionary{{"volume", 0.5F}, {"on", true}}, Array{-1, "é"}, Value()};
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1), callOf(2), whole});
     EXPECT_THAT(historyOnceItHas(3, *record), ElementsAre("call 1", "call 2", "call 3"));
     ASSERT_TRUE(progress.waitFor([&, &made = record->calls] { return made.size() == 3; }));
@@ -356,8 +359,7 @@ TEST_P(ConnectionContract, CarriesAnswersBackInTheirOrderWheneverTheyAreGiven)
             record.connection->send(answer(1));
         return Outcome();
     };
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1), callOf(2), callOf(3)});
     EXPECT_EQ(peer->nextAnswer(), 1);
     ASSERT_THAT(historyOnceItHas(3, *record), SizeIs(3));
@@ -386,8 +388,7 @@ TEST_P(ConnectionContract, IsTheCurrentOneWhileItsCallIsHandledAndAtNoOtherTime)
         return numberOf(call.frame) == 2 ? std::unexpected(Connection::Violation{"it is the second"}) : Outcome();
     };
     onEnd = [&](Record&, std::string_view) { look(); };
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1), callOf(2)});
     EXPECT_THAT(historyOnceItHas(6, *record), SizeIs(6));
     EXPECT_EQ(inCall, record->connection.get());
@@ -397,8 +398,7 @@ TEST_P(ConnectionContract, IsTheCurrentOneWhileItsCallIsHandledAndAtNoOtherTime)
 
 TEST_P(ConnectionContract, SendsTheAnswersOfATurnWhenTheTurnIsOver)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     bool hasArrivedBefore = false;
     subject->serverQueue().submit([&, &made = *record, &other = *peer] {
         made.connection->send(answer(1));
@@ -415,8 +415,7 @@ TEST_P(ConnectionContract, SendsTheAnswersOfATurnWhenTheTurnIsOver)
 TEST_P(ConnectionContract, SendsWithoutWaitingForAPeerThatDoesNotRead)
 {
     constexpr int count = 100;
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     for (int number = 1; number <= count; ++number) // far more than a socket holds
         record->connection->send(support::answerTo({number}, 64 * 1024));
     for (int number = 1; number <= count; ++number)
@@ -458,8 +457,7 @@ TEST_P(ConnectionContract, ReadsNoMoreFromAPeerWhoseUnansweredCallsAreTooLarge)
 
 TEST_P(ConnectionContract, IsInvalidatedOnceWhenThePeerClosesIt)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1)});
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
@@ -469,8 +467,7 @@ TEST_P(ConnectionContract, IsInvalidatedOnceWhenThePeerClosesIt)
 
 TEST_P(ConnectionContract, IsInterruptedOnceAndThenInvalidatedOnceWhenItBreaks)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1)});
     peer->breakOff();
     ASSERT_TRUE(waitForEnd(*record));
@@ -483,8 +480,7 @@ TEST_P(ConnectionContract, BreaksWithACallThatTheHandlerRefusesAndDeliversNoneAf
     onCall = [](Record&, const Connection::Call& call) {
         return numberOf(call.frame) == 2 ? std::unexpected(Connection::Violation{"method 99 is unknown"}) : Outcome();
     };
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1), callOf(2), callOf(3)});
     ASSERT_TRUE(waitForEnd(*record));
     EXPECT_EQ(peer->nextAnswer(), std::nullopt);
@@ -498,8 +494,7 @@ TEST_P(ConnectionContract, DeliversAllCallsThatWereMadeBeforeTheEndHoweverManyAr
     std::vector<Array> calls;
     for (int number = 1; number <= count; ++number)
         calls.push_back(callOf(number));
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call(calls);
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
@@ -523,8 +518,7 @@ TEST_P(ConnectionContract, EndsForItselfAlone)
 
 TEST_P(ConnectionContract, IsOfferedToTheDelegateAndCallsItsHandlersOnOneThread)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1), callOf(2)});
     peer->breakOff();
     ASSERT_TRUE(waitForEnd(*record));
@@ -538,8 +532,7 @@ TEST_P(ConnectionContract, HoldsItsHandlersUntilTheInvalidationHandlerHasReturne
         if (record.holdsAllHandlers())
             heldIn.emplace_back(event);
     };
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1)});
     peer->breakOff();
     ASSERT_TRUE(waitForEnd(*record));
@@ -552,8 +545,7 @@ TEST_P(ConnectionContract, DropsWhatIsSentOnceItIsBroken)
 {
     onCall = [](Record&, const Connection::Call&) { return std::unexpected(Connection::Violation{"none is allowed"}); };
     onEnd = [](Record& record, std::string_view) { record.connection->send(answer(1)); };
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1)});
     ASSERT_TRUE(waitForEnd(*record));
     record->connection->send(answer(2));
@@ -562,8 +554,7 @@ TEST_P(ConnectionContract, DropsWhatIsSentOnceItIsBroken)
 
 TEST_P(ConnectionContract, DropsTheAnswersOfATurnThatItDoesNotOutlive)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     subject->serverQueue().submit([this, &made = *record] {
         made.connection->send(answer(1));
         subject->stop();
@@ -575,8 +566,7 @@ TEST_P(ConnectionContract, DropsTheAnswersOfATurnThatItDoesNotOutlive)
 
 TEST_P(ConnectionContract, LetsACallOutliveIt)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1)});
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
@@ -592,8 +582,7 @@ TEST_P(ConnectionContract, LetsACallOutliveIt)
 
 TEST_P(ConnectionContract, EndsWithoutInterruptionWhenItsListenerStops)
 {
-    listen();
-    const auto [peer, record] = connect();
+    const auto [peer, record] = listenAndConnect();
     const auto [other, otherRecord] = connect();
     subject->stop();
     for (const auto& each : {record, otherRecord}) {

@@ -4,6 +4,7 @@
 // where this machine lets a test have it.
 #include "platform/contract/Contract.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
+#include "platform/linux/trace/DeliveredEvents.h"
 #include "platform/linux/trace/RealTracefs.h"
 #include "platform/linux/trace/TracePages.h"
 #include "platform/linux/trace/TracefsKernelTrace.h"
@@ -145,12 +146,7 @@ public:
           queue(subject.queues().makeSerialQueue("trace", platform::QualityOfService::Default)),
           session(subject.trace().createTraceSession())
     {
-        session->setCompletionHandler([this] {
-            progress_.change([&] {
-                ++completions_;
-                isAsPromised_ = isAsPromised_ && queue->isCurrent();
-            });
-        });
+        delivered_.listenTo(*session, *queue);
     }
     ~Listener()
     {
@@ -162,57 +158,39 @@ public:
 
     [[nodiscard]] int filter(std::uint32_t firstCode, std::uint32_t lastCode)
     {
-        return session->filterEventRange(firstCode, lastCode, [this](const KernelTraceEvent& event) {
-            progress_.change([&] {
-                isAsPromised_ = isAsPromised_ && queue->isCurrent() && completions_ == 0;
-                events_.push_back(event);
-            });
-        });
+        return delivered_.filter(*session, *queue, firstCode, lastCode);
     }
     [[nodiscard]] bool waitForCompletion()
     {
         subject_.work();
-        return progress_.waitFor([&] { return completions_ > 0; });
+        return delivered_.waitForCompletion();
     }
     [[nodiscard]] bool waitForEvents(std::size_t count)
     {
         subject_.work();
-        return progress_.waitFor([&] { return events_.size() >= count; });
+        return delivered_.waitForEvents(count);
     }
-    [[nodiscard]] int completions()
-    {
-        return progress_.look([&] { return completions_; });
-    }
+    [[nodiscard]] int completions() { return delivered_.completions(); }
     [[nodiscard]] std::vector<KernelTraceEvent> events()
     {
-        return progress_.look([&] {
-            EXPECT_TRUE(isAsPromised_) << "handlers run on the queue, and none for an event after the completion";
-            EXPECT_TRUE(std::ranges::is_sorted(events_, {}, &KernelTraceEvent::timestamp));
-            return events_;
-        });
+        const auto events = delivered_.events();
+        EXPECT_TRUE(std::ranges::is_sorted(events, {}, &KernelTraceEvent::timestamp));
+        return events;
     }
-    [[nodiscard]] std::vector<std::uint32_t> codes()
-    {
-        std::vector<std::uint32_t> codes;
-        for (const KernelTraceEvent& event : events())
-            codes.push_back(event.eventCode);
-        return codes;
-    }
+    [[nodiscard]] std::vector<std::uint32_t> codes() { return delivered_.codes(); }
     // Returns when everything that was on the queue has been run.
     void drain()
     {
+        support::Progress progress;
         bool isDrained = false;
-        queue->submit([&] { progress_.change([&] { isDrained = true; }); });
+        queue->submit([&] { progress.change([&] { isDrained = true; }); });
         subject_.work();
-        EXPECT_TRUE(progress_.waitFor([&] { return isDrained; }));
+        EXPECT_TRUE(progress.waitFor([&] { return isDrained; }));
     }
 
 private:
     KernelTraceSubject& subject_;
-    support::Progress progress_;
-    std::vector<KernelTraceEvent> events_;
-    int completions_ = 0;
-    bool isAsPromised_ = true;
+    support::DeliveredEvents delivered_;
 
 public:
     const std::shared_ptr<platform::WorkQueue> queue;

@@ -4,6 +4,7 @@
 
 #include "foundation/Mutex.h"
 #include "platform/Analytics.h"
+#include "support/PrintValues.h"
 
 #include <functional>
 #include <iosfwd>

@@ -7,6 +7,7 @@
 
 #include "foundation/cbor/Cbor.h"
 #include "platform/Connection.h"
+#include "support/PrintValues.h"
 
 #include <deque>
 #include <memory>

@@ -6,6 +6,7 @@
 #include "platform/FeatureFlags.h"
 #include "platform/Preferences.h"
 #include "platform/ProcessTable.h"
+#include "support/PrintValues.h"
 
 #include <map>
 #include <set>

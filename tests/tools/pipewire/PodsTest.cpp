@@ -316,6 +316,11 @@ public:
         end();
         return *this;
     }
+    // A whole cycle of the driver 29, which the node 42 follows.
+    void cycleOfTwo(std::int64_t began, const Times& driverTimes, std::int32_t status, const Times& followerTimes)
+    {
+        cycle(began).driver(29, driverTimes).follower(42, status, followerTimes).endCycle();
+    }
 
 private:
     ProfileBuilder& block(std::uint32_t kind, std::int32_t node, const Times& times, std::int32_t status)
@@ -385,22 +390,10 @@ TEST(ReadCyclesTest, WorkIsFromAwakeToFinishWhereBothAreOfThisCycle)
 TEST(ReadCyclesTest, WhatIsToldAgainWhenADriverSetsOffAfterAPauseIsNoCycle)
 {
     ProfileBuilder profile;
-    profile.cycle(2010656)
-        .driver(29, {1989431, 2010764, 2010867, 2010878})
-        .follower(42, 3, {2010764, 2010766, 2010802, 2010860})
-        .endCycle();
-    profile.cycle(3054813)
-        .driver(29, {2010764, 2010764, 2010867, 3033520})
-        .follower(42, 1, {2010764, 3033520, 3033520, 2010860})
-        .endCycle();
-    profile.cycle(3054813)
-        .driver(29, {2010764, 3033520, 3054934, 3054968})
-        .follower(42, 1, {3033520, 3033520, 3033520, 2010860})
-        .endCycle();
-    profile.cycle(3054813)
-        .driver(29, {3033520, 3054970, 3055085, 3055087})
-        .follower(42, 3, {3054970, 3054972, 3055009, 3055080})
-        .endCycle();
+    profile.cycleOfTwo(2010656, {1989431, 2010764, 2010867, 2010878}, 3, {2010764, 2010766, 2010802, 2010860});
+    profile.cycleOfTwo(3054813, {2010764, 2010764, 2010867, 3033520}, 1, {2010764, 3033520, 3033520, 2010860});
+    profile.cycleOfTwo(3054813, {2010764, 3033520, 3054934, 3054968}, 1, {3033520, 3033520, 3033520, 2010860});
+    profile.cycleOfTwo(3054813, {3033520, 3054970, 3055085, 3055087}, 3, {3054970, 3054972, 3055009, 3055080});
 
     EXPECT_THAT(cycles(profile.build()),
                 ElementsAre("2010764: 42 58 ns, driver 29 11 ns", "3033520: 42 late, driver 29 34 ns",
@@ -420,18 +413,9 @@ TEST(ReadCyclesTest, WhatIsToldBeforeADriversFirstCycleIsNone)
 TEST(ReadCyclesTest, AMissedCycleIsOneThoughItIsToldTwice)
 {
     ProfileBuilder profile;
-    profile.cycle(1054751)
-        .driver(29, {1013600, 1013600, 1019036, 1033523})
-        .follower(42, 1, {1013600, 1033526, 1033524, 1018984})
-        .endCycle();
-    profile.cycle(1054751)
-        .driver(29, {1013600, 1033523, 1054855, 1054876})
-        .follower(42, 1, {1033523, 1033526, 1033524, 1018984})
-        .endCycle();
-    profile.cycle(1076084)
-        .driver(29, {1033523, 1033523, 1054855, 1054877})
-        .follower(42, 1, {1033523, 1054879, 1054877, 1018984})
-        .endCycle();
+    profile.cycleOfTwo(1054751, {1013600, 1013600, 1019036, 1033523}, 1, {1013600, 1033526, 1033524, 1018984});
+    profile.cycleOfTwo(1054751, {1013600, 1033523, 1054855, 1054876}, 1, {1033523, 1033526, 1033524, 1018984});
+    profile.cycleOfTwo(1076084, {1033523, 1033523, 1054855, 1054877}, 1, {1033523, 1054879, 1054877, 1018984});
 
     EXPECT_THAT(cycles(profile.build()), ElementsAre("1033523: 42 late, driver 29 21 ns"));
 }

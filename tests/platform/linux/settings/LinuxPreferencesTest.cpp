@@ -4,6 +4,7 @@
 
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "platform/linux/settings/LinuxFeatureFlags.h"
+#include "support/PrintValues.h"
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
 #include "support/Threads.h"

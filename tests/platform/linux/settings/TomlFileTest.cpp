@@ -1,6 +1,7 @@
 // TOML as values, and files that are broken for a while.
 #include "platform/linux/settings/TomlFile.h"
 
+#include "support/PrintValues.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
 

@@ -2,6 +2,7 @@
 // kernel itself, with real processes that emit, where this machine lets it.
 #include "platform/linux/trace/TracefsKernelTrace.h"
 #include "platform/linux/queues/SerialQueue.h"
+#include "platform/linux/trace/DeliveredEvents.h"
 #include "platform/linux/trace/RealTracefs.h"
 #include "platform/linux/trace/TracePages.h"
 #include "support/Threads.h"
@@ -9,12 +10,10 @@
 
 #include <algorithm>
 #include <atomic>
-#include <condition_variable>
 #include <csignal>
 #include <deque>
 #include <gmock/gmock.h>
 #include <map>
-#include <mutex>
 #include <sys/file.h>
 #include <sys/mman.h>
 #include <sys/resource.h>
@@ -60,20 +59,8 @@ public:
         if (!session)
             throw std::runtime_error("there is no trace");
         session->enableWallTimes(hasWallTimes);
-        session->setCompletionHandler([this] {
-            const std::scoped_lock lock(mutex_);
-            ++completions_;
-            isOnQueue_ &= queue->isCurrent();
-            changed_.notify_all();
-        });
-        EXPECT_EQ(session->filterEventRange(firstCode, lastCode,
-                                            [this](const KernelTraceEvent& event) {
-                                                const std::scoped_lock lock(mutex_);
-                                                isOnQueue_ &= queue->isCurrent() && completions_ == 0;
-                                                events_.push_back(event);
-                                                changed_.notify_all();
-                                            }),
-                  0);
+        delivered_.listenTo(*session, *queue);
+        EXPECT_EQ(delivered_.filter(*session, *queue, firstCode, lastCode), 0);
     }
 
     int start()
@@ -90,29 +77,10 @@ public:
         afterEnd = now();
     }
     // Whether it was completed, and once.
-    [[nodiscard]] bool waitForCompletion()
-    {
-        std::unique_lock lock(mutex_);
-        return changed_.wait_for(lock, patience, [&] { return completions_ > 0; }) && completions_ == 1;
-    }
-    [[nodiscard]] bool waitForEvents(std::size_t count)
-    {
-        std::unique_lock lock(mutex_);
-        return changed_.wait_for(lock, patience, [&] { return events_.size() >= count; });
-    }
-    [[nodiscard]] std::vector<KernelTraceEvent> events()
-    {
-        const std::scoped_lock lock(mutex_);
-        EXPECT_TRUE(isOnQueue_) << "all handlers run on the queue, events before the end";
-        return events_;
-    }
-    [[nodiscard]] std::vector<std::uint32_t> codes()
-    {
-        std::vector<std::uint32_t> codes;
-        for (const KernelTraceEvent& event : events())
-            codes.push_back(event.eventCode);
-        return codes;
-    }
+    [[nodiscard]] bool waitForCompletion() { return delivered_.waitForCompletion() && delivered_.completions() == 1; }
+    [[nodiscard]] bool waitForEvents(std::size_t count) { return delivered_.waitForEvents(count); }
+    [[nodiscard]] std::vector<KernelTraceEvent> events() { return delivered_.events(); }
+    [[nodiscard]] std::vector<std::uint32_t> codes() { return delivered_.codes(); }
 
     std::uint64_t beforeStart = 0;
     std::uint64_t afterStart = 0;
@@ -120,11 +88,7 @@ public:
     std::uint64_t afterEnd = 0;
 
 private:
-    std::mutex mutex_;
-    std::condition_variable changed_;
-    std::vector<KernelTraceEvent> events_;
-    int completions_ = 0;
-    bool isOnQueue_ = true;
+    support::DeliveredEvents delivered_;
 
 public: // these go first
     const std::shared_ptr<SerialQueue> queue =

@@ -1,5 +1,6 @@
 // JSON as values: whole, and a list element by element.
 #include "kesto/files/JsonReader.h"
+#include "support/PrintValues.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

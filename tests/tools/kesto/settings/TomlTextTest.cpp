@@ -2,6 +2,7 @@
 #include "kesto/settings/TomlText.h"
 
 #include "platform/linux/settings/TomlFile.h"
+#include "support/PrintValues.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
