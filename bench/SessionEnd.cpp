@@ -216,7 +216,8 @@ void measureMemory(const Options& options, Report& report)
         ::malloc_trim(0);
         const double before = memory("VmRSS");
         forgetMostMemory();
-        session->stop();
+        platform::Turn turn;
+        session->stop(turn);
         more.push_back(memory("VmHWM") - before);
     }
     clearProgress();

@@ -38,7 +38,7 @@ public:
     void setServiceType(AudioServiceType, std::int64_t, SuccessReply reply) override { answer(reply, true); }
     void getServiceNameForReporterID(std::int64_t, ServiceTypeReply reply) override
     {
-        reply(std::nullopt, AudioServiceTypeUnknown);
+        reply(turn, std::nullopt, AudioServiceTypeUnknown);
         answer(reply, AudioServiceTypeUnknown);
     }
     void setConfiguration(Dictionary configuration, std::int64_t, SuccessReply reply) override
@@ -52,7 +52,7 @@ public:
     {
         ++calls;
         require(!reporterIDs || reporterIDs->size() <= KestoReportingMostReportersOfAMessage);
-        reply(message.empty() ? std::optional(KestoReportingErrorDisabled) : std::nullopt);
+        reply(turn, message.empty() ? std::optional(KestoReportingErrorDisabled) : std::nullopt);
     }
     void stopReportingSessionForID(std::int64_t, SuccessReply reply) override { answer(reply, true); }
     void destroyReportingSession(std::int64_t, SuccessReply reply) override { answer(reply, true); }
@@ -69,12 +69,13 @@ public:
 
     int calls = 0;
     bool isKilled = false;
+    platform::Turn turn;
 
 private:
     template <typename Reply, typename Result> void answer(const Reply& reply, const Result& result)
     {
         ++calls;
-        reply(std::nullopt, result);
+        reply(turn, std::nullopt, result);
     }
 };
 
@@ -87,7 +88,8 @@ public:
     void setInterruptionHandler(EndHandler) override { }
     void setInvalidationHandler(EndHandler) override { }
     void resume() override { }
-    void send(std::string frame) override { sent.push_back(std::move(frame)); }
+    void send(platform::Turn&, std::string frame) override { sent.push_back(std::move(frame)); }
+    void write(std::string) override { }
 
     std::vector<std::string> sent;
 };

@@ -68,7 +68,8 @@ private:
         void setInterruptionHandler(EndHandler) override { }
         void setInvalidationHandler(EndHandler) override { }
         void resume() override { }
-        void send(std::string) override { }
+        void send(platform::Turn&, std::string) override { }
+        void write(std::string) override { }
 
         CallHandler callHandler_;
     };

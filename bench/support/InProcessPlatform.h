@@ -53,13 +53,25 @@ private:
         [[nodiscard]] double secondsSince1970() const override { return 1'767'225'600; }
         [[nodiscard]] double systemUptime() const override { return 86'400; }
     };
-    class ImmediateQueue final : public platform::WorkQueue {
+    class ImmediateQueue final : public platform::TurnQueue {
         void submit(platform::WorkItem item) override { item(); }
+        void submit(platform::TurnItem item) override
+        {
+            platform::Turn turn;
+            item(turn);
+            if (auto send = turn.letters.take())
+                send();
+        }
         [[nodiscard]] bool isCurrent() const override { return true; }
     };
     class WorkQueues final : public platform::WorkQueues {
         [[nodiscard]] std::shared_ptr<platform::WorkQueue> makeSerialQueue(std::string_view,
-                                                                           platform::QualityOfService) override
+                                                                           platform::SerialQueueOptions) override
+        {
+            return std::make_shared<ImmediateQueue>();
+        }
+        [[nodiscard]] std::shared_ptr<platform::TurnQueue> makeTurnQueue(std::string_view,
+                                                                         platform::SerialQueueOptions) override
         {
             return std::make_shared<ImmediateQueue>();
         }
@@ -119,7 +131,8 @@ private:
     };
     class Analytics final : public platform::Analytics {
         [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
-        void sendAnalyticsEventLazy(std::string_view, PayloadBuilder) override { }
+        void sendAnalyticsEventLazy(platform::Turn&, std::string_view, PayloadBuilder) override { }
+        void sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view, PayloadBuilder) override { }
     };
     class TraceMarkers final : public platform::TraceMarkers {
         void emit(std::uint32_t, const std::array<std::uint64_t, 4>&) override { }

@@ -1,8 +1,8 @@
 // The client's life and its operations on sessions. Delivering messages is in a file of its own.
 #include "client/KestoReportingClientServerInstance.h"
 
-#include "client/KestoReportingServerQueue.h"
 #include "foundation/text/Format.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -101,7 +101,7 @@ void KestoReportingClientServerInstance::removeSession(std::int64_t reporterID)
 
 void KestoReportingClientServerInstance::createReportingSession(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self) {
+    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "creating session for reporter {}", reporterID);
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientCreate);
         const bool replaces = self.clientReportingSessionMap_.find(reporterID) != nullptr;
@@ -115,7 +115,7 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
         } else {
             self.countRefusedSession();
         }
-        reply(std::nullopt, true);
+        reply(turn, std::nullopt, true);
     });
 }
 
@@ -132,7 +132,7 @@ void KestoReportingClientServerInstance::countRefusedSession()
 void KestoReportingClientServerInstance::setServiceType(AudioServiceType serviceType, std::int64_t reporterID,
                                                         SuccessReply reply)
 {
-    submit([serviceType, reporterID, reply = std::move(reply)](auto& self) {
+    submit([serviceType, reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "setting service type {} for reporter {}", serviceType,
                   reporterID);
         if (const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false)) {
@@ -140,19 +140,19 @@ void KestoReportingClientServerInstance::setServiceType(AudioServiceType service
             KESTO_LOG(KestoReportingClientCategory(), Default, "service type {} set for reporter  {}", serviceType,
                       reporterID);
         }
-        reply(std::nullopt, true);
+        reply(turn, std::nullopt, true);
     });
 }
 
 void KestoReportingClientServerInstance::getServiceNameForReporterID(std::int64_t reporterID, ServiceTypeReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self) {
+    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "fetching seviceType");
         if (reporterID == 0)
-            reply(std::nullopt, AudioServiceTypeUnknown);
+            reply(turn, std::nullopt, AudioServiceTypeUnknown);
         const auto session = self.findReportingSessionForID(reporterID, true);
         const AudioServiceType serviceType = session ? session->serviceType() : AudioServiceTypeUnknown;
-        reply(std::nullopt, serviceType);
+        reply(turn, std::nullopt, serviceType);
         KESTO_LOG(KestoReportingClientCategory(), Default, "returning service type {} for reporter  {}", serviceType,
                   reporterID);
     });
@@ -161,102 +161,104 @@ void KestoReportingClientServerInstance::getServiceNameForReporterID(std::int64_
 void KestoReportingClientServerInstance::setConfiguration(foundation::Dictionary configuration, std::int64_t reporterID,
                                                           SuccessReply reply)
 {
-    submit([configuration = std::move(configuration), reporterID, reply = std::move(reply)](auto& self) {
+    submit([configuration = std::move(configuration), reporterID, reply = std::move(reply)](auto& self,
+                                                                                            platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "setting configuration");
         if (const auto session = self.findReportingSessionForID(reporterID, false))
             session->updateConfigurationWithContentsOfConfiguration(configuration);
-        reply(std::nullopt, true);
+        reply(turn, std::nullopt, true);
     });
 }
 
 void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self) {
+    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "starting session for reporter {}", reporterID);
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientStart);
         const auto delegate = self.delegate_.lock();
         const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false);
         if (!session || session->started() || !delegate)
-            return reply(std::nullopt, true);
-        start(*delegate, session, reply);
+            return reply(turn, std::nullopt, true);
+        start(turn, *delegate, session, reply);
     });
 }
 
-void KestoReportingClientServerInstance::start(KestoReportingServiceDelegateProtocol& delegate, const Session& session,
-                                               const SuccessReply& reply)
+void KestoReportingClientServerInstance::start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                                               const Session& session, const SuccessReply& reply)
 {
     session->start();
     session->setDriverSnapShot(delegate.getSnapShot());
     if (const auto& earlier = session->transactionCompleteBlock())
-        earlier(std::nullopt, true);
+        earlier(turn, std::nullopt, true);
     session->setTransactionCompleteBlock(reply);
     if (const auto features = delegate.getFeaturesState())
         session->sendMessage(features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
     if (session->mayBeTraced())
-        reply(std::nullopt, true);
+        reply(turn, std::nullopt, true);
     logActiveSessions(delegate);
 }
 
 void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self) {
+    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "stopping session for reporter {}", reporterID);
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientStop);
         if (reporterID == 0)
-            return reply(std::nullopt, true);
+            return reply(turn, std::nullopt, true);
         const auto session = self.findReportingSessionForID(reporterID, false);
         const auto delegate = self.delegate_.lock();
         if (session && session->started() && delegate)
-            stop(*delegate, session);
+            stop(turn, *delegate, session);
         KESTO_LOG(KestoReportingClientCategory(), Default, "stopping {}", reporterID);
-        reply(std::nullopt, true);
+        reply(turn, std::nullopt, true);
     });
 }
 
-void KestoReportingClientServerInstance::stop(KestoReportingServiceDelegateProtocol& delegate, const Session& session)
+void KestoReportingClientServerInstance::stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                                              const Session& session)
 {
-    delegate.sendDriverLogsForSession(session);
+    delegate.sendDriverLogsForSession(turn, session);
     session->setDriverSnapShot(std::nullopt);
-    session->stop();
+    session->stop(turn);
     if (const auto& complete = session->transactionCompleteBlock())
-        complete(std::nullopt, true);
+        complete(turn, std::nullopt, true);
     session->setTransactionCompleteBlock(nullptr);
     logActiveSessions(delegate);
 }
 
 void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self) {
+    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "destroying session for reporter {}", reporterID);
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientDestroy);
         if (reporterID == 0)
-            return reply(std::nullopt, true);
+            return reply(turn, std::nullopt, true);
         if (const auto session = self.clientReportingSessionMap_.find(reporterID)) {
             if (session->started())
-                session->stop();
+                session->stop(turn);
             self.removeSession(reporterID);
         }
         KESTO_LOG(KestoReportingClientCategory(), Default, "destroying {}", reporterID);
-        reply(std::nullopt, true);
+        reply(turn, std::nullopt, true);
     });
 }
 
 void KestoReportingClientServerInstance::reporterID(std::int64_t reporterID, DictionaryReply valid)
 {
-    submit([reporterID, reply = std::move(valid)](auto& self) {
+    submit([reporterID, reply = std::move(valid)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "validating reporter {}", reporterID);
         const auto session = self.findReportingSessionForID(reporterID, true);
         const foundation::Dictionary result{
             {"reporterID", session ? reporterID : 0},
             {"serviceType", session ? session->serviceType() : AudioServiceTypeUnknown}};
         KESTO_LOG(KestoReportingClientCategory(), Default, "validating reporter {}", reporterID);
-        reply(std::nullopt, result);
+        reply(turn, std::nullopt, result);
     });
 }
 
 void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
 {
-    submit([reply = std::move(reply)](auto& self) {
+    submit([reply = std::move(reply)](auto& self, platform::Turn& turn) {
         if (self.isConnectionLost_) // who asked very often and did not listen keeps nobody waiting
             return;
         std::vector<foundation::Value> reporterIDs;
@@ -264,7 +266,7 @@ void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
             for (const auto& client : delegate->getAllClients())
                 for (const auto& entry : client->clientReportingSessionMap())
                     reporterIDs.emplace_back(entry.reporterID);
-        reply(std::nullopt, std::move(reporterIDs));
+        reply(turn, std::nullopt, std::move(reporterIDs));
     });
 }
 
@@ -278,7 +280,7 @@ void KestoReportingClientServerInstance::killService(SuccessReply)
 void KestoReportingClientServerInstance::handleConnectionError()
 {
     isConnectionLost_ = true;
-    submit([](auto& self) {
+    submit([](auto& self, platform::Turn& turn) {
         const auto delegate = self.delegate_.lock();
         if (!delegate || !isRegistered(*delegate, self))
             return;
@@ -286,7 +288,7 @@ void KestoReportingClientServerInstance::handleConnectionError()
         for (const auto& [reporterID, session] : self.clientReportingSessionMap_) {
             reporterIDs.push_back(reporterID);
             if (session->started())
-                session->stop();
+                session->stop(turn);
         }
         std::ranges::for_each(reporterIDs, [&](std::int64_t reporterID) { self.removeSession(reporterID); });
         delegate->removeClient(self.shared_from_this());

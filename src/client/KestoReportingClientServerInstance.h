@@ -4,12 +4,12 @@
 // A call captures its arguments on the connection's thread and does everything else on the server queue.
 #pragma once
 
-#include "client/KestoReportingServerQueue.h"
 #include "client/KestoReportingServiceDelegateProtocol.h"
 #include "client/KestoReportingServiceProtocol.h"
 #include "client/KestoReportingSessionMap.h"
 #include "foundation/Mutex.h"
 #include "session/KestoReportingStorageBudget.h"
+#include "utility/KestoReportingServerQueue.h"
 
 #include <atomic>
 #include <cstdint>
@@ -82,23 +82,26 @@ private:
     };
     using Session = std::shared_ptr<KestoReportingSession>;
 
-    // Runs `work(*this)` on the server queue, with this object kept alive.
+    // Runs `work(*this, turn)` on the server queue, with this object kept alive.
     template <typename Work> void submit(Work work)
     {
-        KestoReportingServerQueue()->submit([self = shared_from_this(), work = std::move(work)] { work(*self); });
+        KestoReportingServerQueue()->submit(
+            [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
     }
-    static void start(KestoReportingServiceDelegateProtocol& delegate, const Session& session,
+    static void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
                       const SuccessReply& reply);
-    static void stop(KestoReportingServiceDelegateProtocol& delegate, const Session& session);
-    void deliverToReporters(KestoReportingServiceDelegateProtocol& delegate, const Message& message,
-                            const ReporterIDs& reporterIDs);
-    void deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
+    static void stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session);
+    void deliverToReporters(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                            const Message& message, const ReporterIDs& reporterIDs);
+    void deliverToActiveSessions(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                                 const Message& message);
     [[nodiscard]] static std::size_t mostReceivers(const Message& message, std::size_t wanted);
     void countRefusedSession();
     void countRefusedReceivers(std::size_t receivers);
-    static void deliverStandalone(KestoReportingServiceDelegateProtocol& delegate, const Message& message);
-    static void deliverToSinks(KestoReportingServiceDelegateProtocol& delegate, const Message& message,
-                               const Session& session);
+    static void deliverStandalone(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                                  const Message& message);
+    static void deliverToSinks(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                               const Message& message, const Session& session);
     static void deliverToSession(const Message& message, const Session& session);
     static void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
     void addSession(std::int64_t reporterID, Session session);

@@ -25,24 +25,25 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
     const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
     auto processName = KestoReportingUtilityProcessNameForPID(sender);
     submit([message = Message{std::move(message), category, type, sender, std::move(processName).value_or("(null)")},
-            reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self) {
+            reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
                   reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
         KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientSendMessage);
         const auto delegate = self.delegate_.lock();
         if (!delegate)
-            return reply(std::nullopt);
+            return reply(turn, std::nullopt);
         if (!delegate->isReportingEnabled())
-            return reply(KestoReportingErrorDisabled);
+            return reply(turn, KestoReportingErrorDisabled);
         if (reporterIDs)
-            self.deliverToReporters(*delegate, message, *reporterIDs);
+            self.deliverToReporters(turn, *delegate, message, *reporterIDs);
         else
-            self.deliverToActiveSessions(*delegate, message);
-        reply(std::nullopt);
+            self.deliverToActiveSessions(turn, *delegate, message);
+        reply(turn, std::nullopt);
     });
 }
 
-void KestoReportingClientServerInstance::deliverToReporters(KestoReportingServiceDelegateProtocol& delegate,
+void KestoReportingClientServerInstance::deliverToReporters(platform::Turn& turn,
+                                                            KestoReportingServiceDelegateProtocol& delegate,
                                                             const Message& message, const ReporterIDs& reporterIDs)
 {
     std::size_t room = mostReceivers(message, reporterIDs.size());
@@ -56,13 +57,14 @@ void KestoReportingClientServerInstance::deliverToReporters(KestoReportingServic
             continue;
         }
         --room;
-        deliverToSinks(delegate, message, session);
+        deliverToSinks(turn, delegate, message, session);
         deliverToSession(message, session);
     }
     countRefusedReceivers(refused);
 }
 
-void KestoReportingClientServerInstance::deliverToActiveSessions(KestoReportingServiceDelegateProtocol& delegate,
+void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn& turn,
+                                                                 KestoReportingServiceDelegateProtocol& delegate,
                                                                  const Message& message)
 {
     const auto active = delegate.getAllActiveReportingSessions();
@@ -72,10 +74,10 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(KestoReportingS
     countRefusedReceivers(active.size() - receivers);
     for (const auto& session : std::span(active).first(receivers)) {
         deliverToSession(message, session);
-        deliverToSinks(delegate, message, session);
+        deliverToSinks(turn, delegate, message, session);
     }
     if (active.empty())
-        deliverStandalone(delegate, message);
+        deliverStandalone(turn, delegate, message);
 }
 
 // A message of a million bytes to ten thousand sessions would hold up all clients for a minute.
@@ -96,7 +98,8 @@ void KestoReportingClientServerInstance::countRefusedReceivers(std::size_t recei
     receiversRefused_ += receivers;
 }
 
-void KestoReportingClientServerInstance::deliverStandalone(KestoReportingServiceDelegateProtocol& delegate,
+void KestoReportingClientServerInstance::deliverStandalone(platform::Turn& turn,
+                                                           KestoReportingServiceDelegateProtocol& delegate,
                                                            const Message& message)
 {
     constexpr std::int64_t standaloneReporterID = 1;
@@ -106,15 +109,16 @@ void KestoReportingClientServerInstance::deliverStandalone(KestoReportingService
     session->updateConfigurationWithContentsOfConfiguration(
         foundation::Dictionary{{KestoReportingHostApplicationKey, "Unknown"}});
     session->updateConfigurationWithContentsOfConfiguration(delegate.getDefaults());
-    deliverToSinks(delegate, message, session);
+    deliverToSinks(turn, delegate, message, session);
     deliverToSession(message, session);
 }
 
-void KestoReportingClientServerInstance::deliverToSinks(KestoReportingServiceDelegateProtocol& delegate,
+void KestoReportingClientServerInstance::deliverToSinks(platform::Turn& turn,
+                                                        KestoReportingServiceDelegateProtocol& delegate,
                                                         const Message& message, const Session& session)
 {
     const auto& [payload, category, type, sender, processName] = message;
-    KestoReportingFennicBridge::handleEvent(payload, category, type, session);
+    KestoReportingFennicBridge::handleEvent(turn, payload, category, type, session);
     KestoReportingGimboUtility::handleEvent(payload, category, type, session);
     KestoReportingTrelmBridge::handleEvent(payload, category, type, session);
     const platform::BugCapture::SenderScope scope(sender);

@@ -34,7 +34,8 @@ public:
     // A sample of all audio drivers, by driver.
     [[nodiscard]] virtual KestoReportingDriverSnapShot getSnapShot() = 0;
     // Reports to the session what the drivers did since its snapshot.
-    virtual void sendDriverLogsForSession(const std::shared_ptr<KestoReportingSession>& session) = 0;
+    virtual void sendDriverLogsForSession(platform::Turn& turn,
+                                          const std::shared_ptr<KestoReportingSession>& session) = 0;
     virtual void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) = 0;
     // Offers the message of a process to the bug-capture manager, which only internal builds have.
     virtual void handleEventForVorp(const foundation::Dictionary& message, AudioEventCategory category,

@@ -27,7 +27,7 @@ public:
 
     // Sends [call, error, values...].
     template <typename... Values>
-    void operator()(const std::optional<KestoReportingError>& error, const Values&... values) const
+    void operator()(platform::Turn& turn, const std::optional<KestoReportingError>& error, const Values&... values) const
     {
         std::string frame;
         foundation::appendCborArrayHead(2 + sizeof...(values), frame);
@@ -37,7 +37,7 @@ public:
         else
             foundation::appendCborNull(frame);
         (foundation::appendCbor(Value(values), frame), ...);
-        caller_->send(std::move(frame));
+        caller_->send(turn, std::move(frame));
     }
 
 private:
@@ -106,7 +106,7 @@ public:
     }
 
     template <typename... Results>
-    void take(std::function<void(const std::optional<KestoReportingError>&, Results...)>& reply)
+    void take(std::function<void(platform::Turn&, const std::optional<KestoReportingError>&, Results...)>& reply)
     {
         reply = std::move(reply_);
     }

@@ -29,9 +29,9 @@ public:
     // A sample of every subscribed driver, by the driver's description. One that fails is missing.
     [[nodiscard]] KestoReportingDriverSnapShot getSnapShot() const;
 
-    // Sends the session, and the analytics bridge, what changed since the session's snapshot: simple values,
-    // histograms and states, each as one message, none where nothing changed.
-    void sendDriverLogsForSession(const std::shared_ptr<KestoReportingSession>& session) const;
+    // Sends the session, and with the turn the analytics bridge, what changed since the session's snapshot: simple
+    // values, histograms and states, each as one message, none where nothing changed.
+    void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) const;
 
     // Each adds one channel of a difference of samples, if there is something to say about it.
     static void processSimpleData(const platform::ReportingChannel& channel, DriverStats& driverStats);

@@ -55,13 +55,14 @@ std::optional<platform::ReportingSample> differenceSince(const KestoReportingDri
     return *std::move(difference);
 }
 
-void send(const std::shared_ptr<KestoReportingSession>& session, DriverStats stats, AudioEventType type)
+void send(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session, DriverStats stats,
+          AudioEventType type)
 {
     if (stats.empty())
         return;
     const foundation::Dictionary message(std::move(stats));
     session->sendMessage(message, categoryCavlet, type, nullptr);
-    KestoReportingFennicBridge::handleEvent(message, categoryCavlet, type, session);
+    KestoReportingFennicBridge::handleEvent(turn, message, categoryCavlet, type, session);
 }
 
 // Keys join their parts with "_", so no part may have one of its own.
@@ -81,7 +82,8 @@ void appendComponent(const std::optional<std::string>& component, std::string& k
 
 } // namespace
 
-void KestoReportingDriverUtility::sendDriverLogsForSession(const std::shared_ptr<KestoReportingSession>& session) const
+void KestoReportingDriverUtility::sendDriverLogsForSession(platform::Turn& turn,
+                                                           const std::shared_ptr<KestoReportingSession>& session) const
 {
     DriverStatsByFormat stats;
     for (const auto& [driver, subscription, channels] : ioChannelSubscriptions_) {
@@ -100,9 +102,9 @@ void KestoReportingDriverUtility::sendDriverLogsForSession(const std::shared_ptr
         for (const auto& channel : difference->channels)
             processChannel(channel, stats);
     }
-    send(session, std::move(stats.simple), typeSimple);
-    send(session, std::move(stats.histogram), typeHistogram);
-    send(session, std::move(stats.state), typeState);
+    send(turn, session, std::move(stats.simple), typeSimple);
+    send(turn, session, std::move(stats.histogram), typeHistogram);
+    send(turn, session, std::move(stats.state), typeState);
 }
 
 void KestoReportingDriverUtility::processSimpleData(const platform::ReportingChannel& channel, DriverStats& driverStats)

@@ -8,6 +8,7 @@
 #pragma once
 
 #include "foundation/values/Value.h"
+#include "platform/Turn.h"
 
 #include <cstdint>
 #include <expected>
@@ -66,10 +67,12 @@ public:
     // Begins to read.
     virtual void resume() = 0;
 
-    // Queues one frame, an encoded CBOR item, to the peer. Never blocks; what is sent to a connection that
-    // broke or is over, or is so before the frame could leave, is dropped. Frames sent on the server queue leave after
-    // the turn, once everything the turn stored is kept. Any thread.
-    virtual void send(std::string frame) = 0;
+    // Sends one frame, an encoded CBOR item, to the peer: it leaves after the turn, once everything that the turn
+    // stored is kept. Never blocks; what is sent to a connection that broke or is over, or is so before the frame could
+    // leave, is dropped.
+    virtual void send(Turn& turn, std::string frame) = 0;
+    // Writes a letter that `send` has filled. Never blocks. Any thread.
+    virtual void write(std::string letter) = 0;
 
 private:
     static inline thread_local const Connection* current_ = nullptr;

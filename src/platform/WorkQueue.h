@@ -1,7 +1,20 @@
 // Work queues: a serial queue a name, the background concurrent queue, and work that starts later.
 //
+// Order: a serial queue runs one item at a time, in the order in which they were submitted. What an item holds is let
+// go of on the queue, before the next item runs. The concurrent queue promises no order.
+//
+// Memory: an item sees what its submitter did before it submitted it, and an item of a serial queue also what all items
+// before it did, on whichever thread each of them ran. So what only the items of one serial queue touch needs no lock.
+//
+// Threads: items belong to their queue, not to a thread. A queue that may be helped has its items run by its own thread
+// or by one that submitted some, which takes them on when it has nothing else to do, and which then runs what others
+// submitted as well. So nothing that an item needs may be thread-local, and a thread holds no lock while it submits to
+// such a queue: the item that takes the same lock might run on that very thread. Debug builds stop who holds one.
+//
 // No queue polls; one that is empty has a sleeping thread, or none.
 #pragma once
+
+#include "platform/Turn.h"
 
 #include <chrono>
 #include <cstdint>
@@ -12,18 +25,33 @@
 namespace platform {
 
 using WorkItem = std::move_only_function<void()>;
+using TurnItem = std::move_only_function<void(Turn& turn)>;
 
 enum class QualityOfService : std::uint8_t { UserInteractive, Default, Background };
 
-// Runs its items; a serial queue one at a time, in the order in which they were submitted. What an item holds is let go
-// of on the queue, on a serial one before the next item runs. A queue that is let go, be it by one of its own items,
-// still runs what was submitted before. Any thread may submit.
+// A queue that is let go, be it by one of its own items, still runs what was submitted before. Any thread may submit.
 class WorkQueue {
 public:
     virtual ~WorkQueue() = default;
     virtual void submit(WorkItem item) = 0;
     // Whether the calling thread is running an item of this queue.
     [[nodiscard]] virtual bool isCurrent() const = 0;
+};
+
+// A serial queue that works in turns: it takes all that waits, runs it, and then hands what the items gathered to the
+// platform, as a whole. Each item gets the turn that it runs in; items that gather nothing go without.
+class TurnQueue : public WorkQueue {
+public:
+    using WorkQueue::submit;
+    virtual void submit(TurnItem item) = 0;
+};
+
+// How a serial queue is run.
+struct SerialQueueOptions {
+    QualityOfService quality = QualityOfService::Default; // the priority of its thread
+    bool mayBeHelped = false; // by a thread that submits, which then runs items itself
+
+    friend bool operator==(const SerialQueueOptions&, const SerialQueueOptions&) = default;
 };
 
 // A counting semaphore. Any thread.
@@ -38,9 +66,11 @@ public:
 class WorkQueues {
 public:
     virtual ~WorkQueues() = default;
-    // Throws std::system_error when there is no thread left for it.
+    // Both throw std::system_error when there is no thread left for the queue.
     [[nodiscard]] virtual std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name,
-                                                                     QualityOfService quality) = 0;
+                                                                     SerialQueueOptions options) = 0;
+    [[nodiscard]] virtual std::shared_ptr<TurnQueue> makeTurnQueue(std::string_view name,
+                                                                   SerialQueueOptions options) = 0;
     // The process's concurrent queue of background priority. It runs a few items side by side: one that waits for
     // another may wait for ever.
     [[nodiscard]] virtual WorkQueue& backgroundQueue() = 0;

@@ -2,8 +2,8 @@
 #include "service/KestoReportingServiceDelegate.h"
 
 #include "client/KestoReportingClientServerInstance.h"
-#include "client/KestoReportingServerQueue.h"
 #include "platform/Platform.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
 
 namespace {

@@ -46,9 +46,9 @@ public:
     [[nodiscard]] Sessions getAllActiveReportingSessions() override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
     [[nodiscard]] KestoReportingDriverSnapShot getSnapShot() override { return driverUtility_->getSnapShot(); }
-    void sendDriverLogsForSession(const std::shared_ptr<KestoReportingSession>& session) override
+    void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) override
     {
-        driverUtility_->sendDriverLogsForSession(session);
+        driverUtility_->sendDriverLogsForSession(turn, session);
     }
     void handleEventForVorp(const foundation::Dictionary& message, AudioEventCategory category, std::uint16_t type,
                             const std::shared_ptr<KestoReportingSession>& session,

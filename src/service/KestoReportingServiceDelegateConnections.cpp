@@ -1,10 +1,10 @@
 // A connection's beginning and end: the client object is made and registered, and when the peer is gone its
 // sessions are stopped and the time it was connected becomes an event.
 #include "client/KestoReportingClientServerInstance.h"
-#include "client/KestoReportingServerQueue.h"
 #include "client/KestoReportingServiceProtocolAdapter.h"
 #include "platform/Platform.h"
 #include "service/KestoReportingServiceDelegate.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <cmath>
@@ -72,6 +72,6 @@ void KestoReportingServiceDelegate::handleInvalidation(
         return;
     }
     platform::current().analytics.sendAnalyticsEventLazy(
-        "com.quarn.kesto.kestoreportingclientuptime",
+        platform::outsideTurn, "com.quarn.kesto.kestoreportingclientuptime",
         [name = *processName, uptime] { return foundation::Dictionary{{"processName", name}, {"seconds", uptime}}; });
 }

@@ -1,9 +1,9 @@
 // Device-wide settings as messages: the accessory setting of the home screen, the device's name and the ringer
 // switch are sent to a session when it starts, and to all sessions when one of them changes.
 #include "client/KestoReportingClientServerInstance.h"
-#include "client/KestoReportingServerQueue.h"
 #include "platform/Platform.h"
 #include "service/KestoReportingServiceDelegate.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <cmath>

@@ -1,8 +1,8 @@
 // What a bug capture keeps of the service: how many clients and sessions there are, and of the sessions so many that
 // whoever asks for a snapshot does not feel it.
 #include "client/KestoReportingClientServerInstance.h"
-#include "client/KestoReportingServerQueue.h"
 #include "service/KestoReportingServiceDelegate.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingVocabulary.h"
 
 foundation::Value KestoReportingServiceDelegate::stateForBugCapture() const

@@ -138,14 +138,14 @@ void KestoReportingSession::start()
     startTracing();
 }
 
-void KestoReportingSession::stop()
+void KestoReportingSession::stop(platform::Turn& turn)
 {
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     if (!started_)
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStopping);
-    sendVolumeEvents();
+    sendVolumeEvents(turn);
     writeSummaryJson();
     sendSummaryEvent();
     stopTracing();
@@ -174,7 +174,7 @@ std::shared_ptr<const KestoReportingMessageStore> KestoReportingSession::store()
     return nestedAggregatedPayloadData_;
 }
 
-void KestoReportingSession::sendVolumeEvents()
+void KestoReportingSession::sendVolumeEvents(platform::Turn& turn)
 {
     const auto application = KestoReportingUtilityRetrieveAppName(configuration());
     const auto process = application.isNull() ? std::nullopt : std::optional(application);
@@ -189,7 +189,7 @@ void KestoReportingSession::sendVolumeEvents()
         const auto volumeEvent = std::exchange(next, {}); // it goes once the store has it
         share.shrink(paidForEach);
         sendMessage(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
-        KestoReportingFennicBridge::handleEvent(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,
+        KestoReportingFennicBridge::handleEvent(turn, volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,
                                                 shared_from_this());
     }
 }

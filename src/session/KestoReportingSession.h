@@ -14,6 +14,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <span>
@@ -61,8 +62,9 @@ public:
     [[nodiscard]] bool started() const { return started_; }
     // Begins a run with an empty store; a session that is started already goes on as it is.
     void start();
-    // Ends the run and drops what it recorded. Nothing happens to a session that is not started.
-    void stop();
+    // Ends the run and drops what it recorded; the events that it makes of that go with the turn. Nothing happens to a
+    // session that is not started.
+    void stop(platform::Turn& turn);
 
     // Whether sessions of this service type may run kernel traces: those for tests, where the feature is enabled and
     // the system can trace.
@@ -78,12 +80,14 @@ public:
     [[nodiscard]] const TraceRunner* traceRunner() const { return traceRunner_.get(); }
     [[nodiscard]] const TraceParams* traceParams() const { return traceParams_.get(); }
 
+    // Called before the message's function returns, if at all.
+    using MessageReply = std::function<void(const std::optional<KestoReportingError>& error)>;
     // Normalises and records the message, then calls the reply, if there is one, with no error. `sync` makes no
     // difference: the message is always handled at once on the caller's thread. No message is an empty one.
     void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
-                     AudioEventType type, bool sync, const KestoReportingReply& reply);
+                     AudioEventType type, bool sync, const MessageReply& reply);
     void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
-                     AudioEventType type, const KestoReportingReply& reply);
+                     AudioEventType type, const MessageReply& reply);
     // Records the normalised message, unless it repeats the one before of its kind: true when it was dropped
     // for that.
     bool createMessageIdentifier(AudioEventCategory category, AudioEventType type,
@@ -91,7 +95,7 @@ public:
     // Accepts a message outside of any session and does nothing with it, a second later; the reply is not called.
     static void sendSingleMessage(const foundation::Dictionary& message, AudioEventCategory category,
                                   AudioEventType type, AudioServiceType serviceType,
-                                  const foundation::Dictionary& userInfo, const KestoReportingReply& reply);
+                                  const foundation::Dictionary& userInfo, const MessageReply& reply);
 
     // The payloads of the messages in order, those that carry any of the keys folded together: one that comes no more
     // than the pause (seconds) after the one before joins it, at the place of the first of them. This is the
@@ -154,7 +158,7 @@ public:
 private:
     [[nodiscard]] std::shared_ptr<const KestoReportingMessageStore> store() const;
     [[nodiscard]] std::string summaryFileName() const;
-    void sendVolumeEvents();
+    void sendVolumeEvents(platform::Turn& turn);
     void sendSummaryEvent();
     void letGoOfMessages();
     void startTracing();

@@ -10,7 +10,7 @@
 
 void KestoReportingSession::sendMessage(const std::optional<foundation::Dictionary>& message,
                                         AudioEventCategory category, AudioEventType type, [[maybe_unused]] bool sync,
-                                        const KestoReportingReply& reply)
+                                        const MessageReply& reply)
 {
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending message for session owned by {}", reporterID_);
     createMessageIdentifier(
@@ -22,8 +22,7 @@ void KestoReportingSession::sendMessage(const std::optional<foundation::Dictiona
 }
 
 void KestoReportingSession::sendMessage(const std::optional<foundation::Dictionary>& message,
-                                        AudioEventCategory category, AudioEventType type,
-                                        const KestoReportingReply& reply)
+                                        AudioEventCategory category, AudioEventType type, const MessageReply& reply)
 {
     sendMessage(message, category, type, false, reply);
 }
@@ -49,7 +48,7 @@ bool KestoReportingSession::createMessageIdentifier(AudioEventCategory category,
 
 void KestoReportingSession::sendSingleMessage(const foundation::Dictionary&, AudioEventCategory, AudioEventType,
                                               AudioServiceType serviceType, const foundation::Dictionary&,
-                                              const KestoReportingReply&)
+                                              const MessageReply&)
 {
     constexpr std::chrono::nanoseconds delay(1'000'000'000);
     constexpr std::int64_t mostDelta = 59;

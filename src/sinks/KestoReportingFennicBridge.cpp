@@ -69,8 +69,8 @@ const EventNames& eventNames(AudioEventCategory category, AudioEventType type, A
 
 } // namespace
 
-void KestoReportingFennicBridge::handleEvent(const foundation::Dictionary& message, AudioEventCategory category,
-                                             AudioEventType type,
+void KestoReportingFennicBridge::handleEvent(platform::Turn& turn, const foundation::Dictionary& message,
+                                             AudioEventCategory category, AudioEventType type,
                                              const std::shared_ptr<const KestoReportingSinkSession>& session)
 {
     platform::Analytics& analytics = platform::current().analytics;
@@ -80,7 +80,7 @@ void KestoReportingFennicBridge::handleEvent(const foundation::Dictionary& messa
             return;
         if (!payload)
             payload = std::make_shared<LazyPayload>(message, session);
-        analytics.sendAnalyticsEventLazy(eventName, [payload] { return payload->build(); });
+        analytics.sendAnalyticsEventLazy(turn, eventName, [payload] { return payload->build(); });
     };
     const EventNames& names = eventNames(category, type, session->serviceType());
     offer(names.ofAllServices);

@@ -4,15 +4,16 @@
 // Nothing is filtered here. Whether an event is kept is decided by whether somebody wants its name.
 #pragma once
 
+#include "platform/Turn.h"
 #include "sinks/KestoReportingSinkSession.h"
 
 #include <memory>
 
-// Keeps no state. Any thread.
+// Keeps no state. On the server queue.
 class KestoReportingFennicBridge {
 public:
-    // Offers "com.quarn.kesto.<category>.<type>" and "com.quarn.<service>.<category>.<type>", in this order. The
-    // payload is the message as it came, with the session's host application added where it names none.
-    static void handleEvent(const foundation::Dictionary& message, AudioEventCategory category, AudioEventType type,
-                            const std::shared_ptr<const KestoReportingSinkSession>& session);
+    // Sends with the turn "com.quarn.kesto.<category>.<type>" and "com.quarn.<service>.<category>.<type>", in this
+    // order. The payload is the message as it came, with the session's host application added where it names none.
+    static void handleEvent(platform::Turn& turn, const foundation::Dictionary& message, AudioEventCategory category,
+                            AudioEventType type, const std::shared_ptr<const KestoReportingSinkSession>& session);
 };

@@ -24,7 +24,7 @@ TraceRunner::TraceRunner()
 {
     platform::WorkQueues& queues = platform::current().workQueues;
     tracingSemaphore_ = queues.makeSemaphore(0);
-    tracingQueue_ = queues.makeSerialQueue("Tracing Queue", platform::QualityOfService::Default);
+    tracingQueue_ = queues.makeSerialQueue("Tracing Queue", {});
     ++runners;
 }
 

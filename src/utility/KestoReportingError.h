@@ -1,6 +1,8 @@
 // The one error that a client can be answered with, and the callbacks that carry answers.
 #pragma once
 
+#include "platform/Turn.h"
+
 #include <cstdint>
 #include <functional>
 #include <optional>
@@ -16,7 +18,9 @@ struct KestoReportingError {
 // Reporting is disabled on this device.
 constexpr KestoReportingError KestoReportingErrorDisabled{"com.quarn.audio.reporting", 1};
 
-// Callbacks that get the error, if any, and the operation's result. May be copied, and called more than once.
-using KestoReportingReply = std::function<void(const std::optional<KestoReportingError>& error)>;
+// Callbacks that answer a client: with the turn that the answer leaves with, the error, if any, and the operation's
+// result. May be copied, and called more than once.
+using KestoReportingReply = std::function<void(platform::Turn& turn, const std::optional<KestoReportingError>& error)>;
 template <typename Result>
-using KestoReportingResultReply = std::function<void(const std::optional<KestoReportingError>& error, Result result)>;
+using KestoReportingResultReply =
+    std::function<void(platform::Turn& turn, const std::optional<KestoReportingError>& error, Result result)>;

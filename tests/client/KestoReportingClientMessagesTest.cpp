@@ -324,7 +324,8 @@ public:
     MOCK_METHOD(Sessions, getAllActiveReportingSessions, (), (override));
     MOCK_METHOD(std::shared_ptr<KestoReportingSession>, findReportingSessionForID, (std::int64_t), (override));
     MOCK_METHOD(KestoReportingDriverSnapShot, getSnapShot, (), (override));
-    MOCK_METHOD(void, sendDriverLogsForSession, (const std::shared_ptr<KestoReportingSession>&), (override));
+    MOCK_METHOD(void, sendDriverLogsForSession, (platform::Turn&, const std::shared_ptr<KestoReportingSession>&),
+                (override));
     MOCK_METHOD(void, removeClient, (const std::shared_ptr<KestoReportingClientServerInstance>&), (override));
     MOCK_METHOD(void, handleEventForVorp,
                 (const Dictionary&, AudioEventCategory, std::uint16_t, const std::shared_ptr<KestoReportingSession>&,
@@ -347,7 +348,7 @@ protected:
 
     void createSession(std::int64_t reporterID)
     {
-        client->createReportingSession(reporterID, [](const auto&, bool) { });
+        client->createReportingSession(reporterID, [](auto&, const auto&, bool) { });
         platform.workQueues.runAll();
     }
     // The error of each answer.
@@ -355,7 +356,7 @@ protected:
     {
         std::vector<std::optional<KestoReportingError>> answers;
         client->sendMessage({{"a", 1}}, 0x10000004, 2, std::move(reporterIDs),
-                            [&](const auto& error) { answers.push_back(error); });
+                            [&](auto&, const auto& error) { answers.push_back(error); });
         platform.workQueues.runAll();
         return answers;
     }
@@ -435,7 +436,7 @@ TEST_F(ClientAndServiceTest, TakesTheSendersNameWhenTheCallIsMade)
     createSession(42);
     platform.processTable.add(17, "player");
     EXPECT_CALL(*service, handleEventForVorp(_, _, _, _, "player"));
-    client->sendMessage({}, 4, 1, std::vector<std::int64_t>{42}, [](const auto&) { });
+    client->sendMessage({}, 4, 1, std::vector<std::int64_t>{42}, [](auto&, const auto&) { });
     platform.processTable.remove(17);
     platform.workQueues.runAll();
 }
@@ -475,7 +476,7 @@ TEST_F(ClientAndServiceTest, StartsInOrder)
     const KestoReportingDriverSnapShot snapShot{{"Rx-(null)", {}}};
     int answers = 0;
     testing::MockFunction<void()> earlierCallback;
-    session(42)->setTransactionCompleteBlock([&](const auto&, bool) { earlierCallback.Call(); });
+    session(42)->setTransactionCompleteBlock([&](auto&, const auto&, bool) { earlierCallback.Call(); });
 
     const testing::InSequence inOrder;
     EXPECT_CALL(*service, getSnapShot).WillOnce([&] {
@@ -486,7 +487,7 @@ TEST_F(ClientAndServiceTest, StartsInOrder)
         EXPECT_EQ(session(42)->driverSnapShot()->begin()->first, "Rx-(null)");
     });
     EXPECT_CALL(*service, getFeaturesState).WillOnce([&] {
-        session(42)->transactionCompleteBlock()(std::nullopt, true); // the new one is stored by now
+        session(42)->transactionCompleteBlock()(platform.turn, std::nullopt, true); // the new one is stored by now
         EXPECT_EQ(answers, 1);
         return Dictionary{{"ringerstate", true}};
     });
@@ -494,7 +495,7 @@ TEST_F(ClientAndServiceTest, StartsInOrder)
         EXPECT_THAT(*session(42)->nestedAggregatedPayloadData(), SizeIs(1)) << "the features were told";
         return KestoReportingServiceDelegateProtocol::Sessions{};
     });
-    client->startReportingSessionForID(42, [&](const auto&, bool) { ++answers; });
+    client->startReportingSessionForID(42, [&](auto&, const auto&, bool) { ++answers; });
     platform.workQueues.runAll();
 }
 
@@ -504,11 +505,11 @@ TEST_F(ClientAndServiceTest, StopsInOrder)
     ON_CALL(*service, getSnapShot).WillByDefault(Return(KestoReportingDriverSnapShot{{"Rx-(null)", {}}}));
     testing::MockFunction<void()> startAnswer;
     testing::MockFunction<void()> stopAnswer;
-    client->startReportingSessionForID(42, [&](const auto&, bool) { startAnswer.Call(); });
+    client->startReportingSessionForID(42, [&](auto&, const auto&, bool) { startAnswer.Call(); });
     platform.workQueues.runAll();
 
     const testing::InSequence inOrder;
-    EXPECT_CALL(*service, sendDriverLogsForSession(session(42))).WillOnce([](const auto& stopping) {
+    EXPECT_CALL(*service, sendDriverLogsForSession(_, session(42))).WillOnce([](auto&, const auto& stopping) {
         EXPECT_TRUE(stopping->started());
         EXPECT_NE(stopping->driverSnapShot(), std::nullopt);
     });
@@ -521,7 +522,7 @@ TEST_F(ClientAndServiceTest, StopsInOrder)
         return KestoReportingServiceDelegateProtocol::Sessions{};
     });
     EXPECT_CALL(stopAnswer, Call);
-    client->stopReportingSessionForID(42, [&](const auto&, bool) { stopAnswer.Call(); });
+    client->stopReportingSessionForID(42, [&](auto&, const auto&, bool) { stopAnswer.Call(); });
     platform.workQueues.runAll();
 }
 
@@ -530,12 +531,12 @@ TEST_F(ClientAndServiceTest, SendsNoDriverLogsForASessionThatIsDestroyedOrLost)
     createSession(42);
     createSession(43);
     for (const std::int64_t reporterID : {42, 43})
-        client->startReportingSessionForID(reporterID, [](const auto&, bool) { });
+        client->startReportingSessionForID(reporterID, [](auto&, const auto&, bool) { });
     platform.workQueues.runAll();
     EXPECT_CALL(*service, sendDriverLogsForSession).Times(0);
     const KestoReportingServiceDelegateProtocol::Clients clients{client};
     ON_CALL(*service, getAllClients).WillByDefault(testing::ReturnRef(clients));
-    client->destroyReportingSession(42, [](const auto&, bool) { });
+    client->destroyReportingSession(42, [](auto&, const auto&, bool) { });
     client->handleConnectionError();
     platform.workQueues.runAll();
     EXPECT_EQ(client->clientReportingSessionMap().size(), 0U);
@@ -545,7 +546,7 @@ TEST_F(ClientAndServiceTest, ShowsTheServicesCountOfActiveSessionsWhateverItIs)
 {
     createSession(42);
     ON_CALL(*service, activeSessionCount).WillByDefault(Return(-7));
-    client->startReportingSessionForID(42, [](const auto&, bool) { });
+    client->startReportingSessionForID(42, [](auto&, const auto&, bool) { });
     platform.workQueues.runAll();
     EXPECT_THAT(platform.log.lines("kerc").back(), IsLine(Default, "kerc", "-7 active reporting session(s) []"));
 }
@@ -562,7 +563,7 @@ TEST_F(ClientAndServiceTest, TellsTheServiceWhichIDsItsMapGainsAndLoses)
     ON_CALL(*service, getAllClients).WillByDefault(testing::ReturnRef(clients));
     createSession(42);
     createSession(0);
-    client->destroyReportingSession(42, [](const auto&, bool) { });
+    client->destroyReportingSession(42, [](auto&, const auto&, bool) { });
     client->handleConnectionError();
     platform.workQueues.runAll();
 }

@@ -243,7 +243,7 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanAllClientsMayHaveTogether)
     const auto fill = [&](std::size_t count) {
         clients.push_back(std::make_shared<KestoReportingClientServerInstance>(17, harness.service));
         for (std::size_t index = 0; index < count; ++index)
-            clients.back()->createReportingSession(static_cast<std::int64_t>(index), [](const auto&, bool) { });
+            clients.back()->createReportingSession(static_cast<std::int64_t>(index), [](auto&, const auto&, bool) { });
         platform.workQueues.runAll();
         platform.log.clear();
         platform.traceMarkers.take();
@@ -468,7 +468,7 @@ TEST_F(ClientTest, AnswersACallbackThatTheSessionStillHoldsBeforeItStoresTheNext
 {
     create(42);
     int answered = 0;
-    player.session(42)->setTransactionCompleteBlock([&](const auto& error, bool success) {
+    player.session(42)->setTransactionCompleteBlock([&](auto&, const auto& error, bool success) {
         EXPECT_EQ(error, std::nullopt);
         EXPECT_TRUE(success);
         ++answered;

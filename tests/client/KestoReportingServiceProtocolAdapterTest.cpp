@@ -50,7 +50,15 @@ protected:
         return result ? std::nullopt : std::optional(result.error().reason);
     }
     void accept(const Array& frame) { EXPECT_EQ(refusal(frame), std::nullopt); }
+    // Ends the turn: all that was answered.
+    const std::vector<Array>& answers()
+    {
+        if (auto send = turn.letters.take())
+            send();
+        return connection->received();
+    }
 
+    platform::Turn turn;
     // A strict mock: whatever is called unexpectedly is a failure.
     std::shared_ptr<StrictMock<MockProtocol>> protocol = std::make_shared<StrictMock<MockProtocol>>();
     std::shared_ptr<support::FakeConnection> connection = std::make_shared<support::FakeConnection>(7);
@@ -281,16 +289,22 @@ TEST_F(AdapterTest, RefusesListsOfMoreReportersThanAMessageMayHave)
 TEST_F(AdapterTest, AnswersWithTheCallsNumberTheErrorAndTheValues)
 {
     const testing::InSequence inOrder;
-    EXPECT_CALL(*protocol, createReportingSession).WillOnce([](auto, auto reply) { reply(std::nullopt, true); });
-    EXPECT_CALL(*protocol, stopReportingSessionForID).WillOnce([](auto, auto reply) { reply(std::nullopt, false); });
-    EXPECT_CALL(*protocol, getServiceNameForReporterID).WillOnce([](auto, auto reply) { reply(std::nullopt, 65535); });
-    EXPECT_CALL(*protocol, reporterID).WillOnce([](auto, auto reply) {
-        reply(std::nullopt, Dictionary{{"reporterID", 0}, {"serviceType", 65535}});
+    EXPECT_CALL(*protocol, createReportingSession).WillOnce([&](auto, auto reply) { reply(turn, std::nullopt, true); });
+    EXPECT_CALL(*protocol, stopReportingSessionForID).WillOnce([&](auto, auto reply) {
+        reply(turn, std::nullopt, false);
     });
-    EXPECT_CALL(*protocol, getAllReporters).WillOnce([](auto reply) { reply(std::nullopt, Array{1, leastID}); });
-    EXPECT_CALL(*protocol, sendMessage).WillOnce([](auto, auto, auto, auto, auto reply) { reply(std::nullopt); });
-    EXPECT_CALL(*protocol, sendMessage).WillOnce([](auto, auto, auto, auto, auto reply) {
-        reply(KestoReportingErrorDisabled);
+    EXPECT_CALL(*protocol, getServiceNameForReporterID).WillOnce([&](auto, auto reply) {
+        reply(turn, std::nullopt, 65535);
+    });
+    EXPECT_CALL(*protocol, reporterID).WillOnce([&](auto, auto reply) {
+        reply(turn, std::nullopt, Dictionary{{"reporterID", 0}, {"serviceType", 65535}});
+    });
+    EXPECT_CALL(*protocol, getAllReporters).WillOnce([&](auto reply) { reply(turn, std::nullopt, Array{1, leastID}); });
+    EXPECT_CALL(*protocol, sendMessage).WillOnce([&](auto, auto, auto, auto, auto reply) {
+        reply(turn, std::nullopt);
+    });
+    EXPECT_CALL(*protocol, sendMessage).WillOnce([&](auto, auto, auto, auto, auto reply) {
+        reply(turn, KestoReportingErrorDisabled);
     });
     accept({1, 1, 42});
     accept({2, 7, 42});
@@ -299,7 +313,7 @@ TEST_F(AdapterTest, AnswersWithTheCallsNumberTheErrorAndTheValues)
     accept({5, 10});
     accept({largestCall, 6, Dictionary{}, 4, 1, null});
     accept({7, 6, Dictionary{}, 4, 1, null});
-    EXPECT_THAT(connection->received(),
+    EXPECT_THAT(answers(),
                 ElementsAre(Array{1, null, true}, Array{2, null, false}, Array{3, null, 65535},
                             Array{4, null, Dictionary{{"reporterID", 0}, {"serviceType", 65535}}},
                             Array{5, null, Array{1, leastID}}, Array{largestCall, null},
@@ -308,28 +322,30 @@ TEST_F(AdapterTest, AnswersWithTheCallsNumberTheErrorAndTheValues)
 
 TEST_F(AdapterTest, AnswersBooleansAsBooleansAndNumbersAsIntegers)
 {
-    EXPECT_CALL(*protocol, createReportingSession).WillOnce([](auto, auto reply) { reply(std::nullopt, true); });
-    EXPECT_CALL(*protocol, getServiceNameForReporterID).WillOnce([](auto, auto reply) { reply(std::nullopt, 1); });
+    EXPECT_CALL(*protocol, createReportingSession).WillOnce([&](auto, auto reply) { reply(turn, std::nullopt, true); });
+    EXPECT_CALL(*protocol, getServiceNameForReporterID).WillOnce([&](auto, auto reply) {
+        reply(turn, std::nullopt, 1);
+    });
     accept({1, 1, 42});
     accept({2, 3, 42});
     using Kind = foundation::Number::Kind;
-    EXPECT_EQ(connection->received().at(0)[2].number()->kind(), Kind::Boolean);
-    EXPECT_EQ(connection->received().at(1)[2].number()->exactly<std::uint16_t>(), 1);
+    EXPECT_EQ(answers().at(0)[2].number()->kind(), Kind::Boolean);
+    EXPECT_EQ(answers().at(1)[2].number()->exactly<std::uint16_t>(), 1);
 }
 
 TEST_F(AdapterTest, AnswersACallAsOftenAndAsLateAsItIsTold)
 {
     KestoReportingServiceProtocol::SuccessReply held;
     EXPECT_CALL(*protocol, startReportingSessionForID).WillOnce([&](auto, auto reply) { held = std::move(reply); });
-    EXPECT_CALL(*protocol, getServiceNameForReporterID).WillOnce([](auto, auto reply) {
-        reply(std::nullopt, 65535);
-        reply(std::nullopt, 4);
+    EXPECT_CALL(*protocol, getServiceNameForReporterID).WillOnce([&](auto, auto reply) {
+        reply(turn, std::nullopt, 65535);
+        reply(turn, std::nullopt, 4);
     });
     accept({1, 5, 42});
     accept({2, 3, 0});
-    held(std::nullopt, true);
-    held(std::nullopt, true);
-    EXPECT_THAT(connection->received(),
+    held(turn, std::nullopt, true);
+    held(turn, std::nullopt, true);
+    EXPECT_THAT(answers(),
                 ElementsAre(Array{2, null, 65535}, Array{2, null, 4}, Array{1, null, true}, Array{1, null, true}));
 }
 
@@ -339,7 +355,8 @@ TEST_F(AdapterTest, HoldsACallersConnectionUntilNobodyCanAnswerItAnyMore)
     EXPECT_CALL(*protocol, startReportingSessionForID).WillOnce([&](auto, auto reply) { held = std::move(reply); });
     accept({1, 5, 42});
     EXPECT_EQ(connection.use_count(), 2);
-    held(std::nullopt, true);
+    held(turn, std::nullopt, true);
+    (void)answers();
     EXPECT_EQ(connection.use_count(), 2);
     held = nullptr;
     EXPECT_EQ(connection.use_count(), 1);

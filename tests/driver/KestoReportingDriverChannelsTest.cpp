@@ -45,7 +45,7 @@ protected:
     std::map<std::string, std::string> end(const std::string& kind)
     {
         fakes.analytics.clear();
-        utility->sendDriverLogsForSession(session);
+        utility->sendDriverLogsForSession(fakes.turn, session);
         std::map<std::string, std::string> statistics;
         for (const Dictionary& payload : fakes.analytics.payloads("com.quarn.kesto.Cavlet." + kind))
             for (const auto& [key, value] : payload)

@@ -263,7 +263,7 @@ protected:
     // What the session was told, as "identifier: payload".
     std::vector<std::string> end()
     {
-        utility->sendDriverLogsForSession(session);
+        utility->sendDriverLogsForSession(platform.turn, session);
         std::vector<std::string> messages;
         for (const Dictionary& message : session->nestedAggregatedPayloadData().value_or(std::vector<Dictionary>()))
             for (const auto& [identifier, payload] : message)

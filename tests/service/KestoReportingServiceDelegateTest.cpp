@@ -23,8 +23,10 @@ TEST(ServiceMaking, BeginsWithTheServerQueue)
     const TestPlatform platform;
     const auto service = KestoReportingServiceDelegate::make();
     EXPECT_THAT(platform.workQueues.made(),
-                ElementsAre(FakeWorkQueues::MadeQueue{"com.quarn.kesto.reporting.server",
-                                                      platform::QualityOfService::UserInteractive}));
+                ElementsAre(FakeWorkQueues::MadeQueue{
+                    .name = "com.quarn.kesto.reporting.server",
+                    .options = {.quality = platform::QualityOfService::UserInteractive, .mayBeHelped = true},
+                    .hasTurns = true}));
     EXPECT_FALSE(KestoReportingServerQueue()->isCurrent());
     EXPECT_EQ(gReportingQueueName, "com.quarn.kesto.reporting.server");
 }
@@ -283,7 +285,7 @@ TEST(ServiceDriverStatistics, AreTakenAndReportedByItsSampler)
     session->setDriverSnapShot(snapShot);
     underruns.value = 8;
     harness.platform.reportingChannels.publish(underruns);
-    onQueue([&] { harness.service->sendDriverLogsForSession(session); });
+    onQueue([&](platform::Turn& turn) { harness.service->sendDriverLogsForSession(turn, session); });
     const auto messages = session->nestedAggregatedPayloadData().value();
     ASSERT_THAT(messages, SizeIs(1));
     const Dictionary told = *messages[0].values()[0].dictionary();

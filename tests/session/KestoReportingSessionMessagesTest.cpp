@@ -264,7 +264,7 @@ TEST_F(SessionMessagesTest, TellWhetherTheyWereDropped)
 
 TEST_F(SessionMessagesTest, ToASessionThatIsNotStartedAreNotRecorded)
 {
-    session->stop();
+    session->stop(platform.turn);
     platform.log.clear();
     platform.traceMarkers.take();
     send(Dictionary{{"a", 1}});
@@ -294,7 +294,7 @@ TEST_F(SessionMessagesTest, AreAnsweredBeforeTheCallReturnsWithNoErrorWhateverBe
     for (const bool sync : {true, false})
         session->sendMessage(Dictionary{{"a", 1}}, playback, start, sync, reply);
     session->sendMessage(Dictionary{{"a", 1}}, playback, start, reply);
-    session->stop();
+    session->stop(platform.turn);
     platform.traceMarkers.take();
     session->sendMessage(Dictionary{{"a", 1}}, playback, start, reply);
     EXPECT_EQ(replies, 4);
@@ -328,14 +328,14 @@ TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
                     .Times(1));
 
     platform.log.clear();
-    session.stop();
+    session.stop(platform.turn);
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerr", "session 42 lost 4 messages for want of memory")))
         << "its summary is the fourth";
     EXPECT_EQ(budget->taken(), 0U);
 
     platform.log.clear();
     session.start();
-    session.stop();
+    session.stop(platform.turn);
     EXPECT_THAT(platform.log.lines(), Not(Contains(testing::Field("level", &support::LogLine::level, Error))))
         << "the next run has lost nothing";
 }

@@ -66,7 +66,7 @@ protected:
             if (code == accepted)
                 steps.push_back("recorded " + identifiers().back());
         });
-        session->stop();
+        session->stop(platform.turn);
         platform.log.setObserver(nullptr);
         platform.analytics.setObserver(nullptr);
         platform.traceMarkers.setObserver(nullptr);
@@ -104,7 +104,7 @@ TEST_F(SessionStop, SaysWhatItDoesAtItsLevel)
 {
     play();
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     const auto lines = platform.log.lines("kerr");
     const auto sending = IsLine(Debug, "kerr", "sending message for session owned by 42");
     ASSERT_THAT(lines, SizeIs(8));
@@ -125,14 +125,14 @@ TEST_F(SessionStop, MarksItsMomentsForTheKernelTrace)
 {
     play();
     platform.traceMarkers.take();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(stopping, accepted, accepted, accepted));
 }
 
 TEST_F(SessionStop, HandsVolumeEventsToTheBridgeAsTheyWereMade)
 {
     play();
-    session->stop();
+    session->stop(platform.turn);
     const auto events = platform.analytics.payloads("com.quarn.kesto.Volume.Summary");
     ASSERT_THAT(events, SizeIs(2));
     EXPECT_EQ(Value(events[1]).text(),
@@ -147,7 +147,7 @@ TEST_F(SessionStop, HandsVolumeEventsToTheBridgeAsTheyWereMade)
 TEST_F(SessionStop, PutsVolumeEventsIntoTheFileButNotTheSummary)
 {
     play();
-    session->stop();
+    session->stop(platform.turn);
     ASSERT_THAT(platform.fileSystem.files, SizeIs(1));
     const std::string& text = platform.fileSystem.files.begin()->second;
     EXPECT_THAT(text, HasSubstr("\"Volume_Summary_2\": {"));
@@ -161,7 +161,7 @@ TEST_F(SessionStop, PutsVolumeEventsIntoTheSummaryUnderItsOwnTag)
     Dictionary summary;
     platform.traceMarkers.setObserver(
         [&](std::uint32_t) { summary = *session->nestedAggregatedPayloadData()->back().begin()->value.dictionary(); });
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_EQ(summary.find("play_seconds")->text(), "30,70");
     EXPECT_EQ(summary.find("PomoSessionVolume")->text(), "0.5,0.75,0.5,0.75");
     EXPECT_EQ(summary.find("KESTO_Session_Summary_Event")->text(), "7");
@@ -187,7 +187,7 @@ TEST_F(SessionStop, RecordsNoVolumeEventThatRepeatsTheOneBeforeButHandsItToTheBr
                                       {"msgcnt", 2}};
     session->sendMessage(asTheFirstWillBe.with("kestoreporting_timestamp", 100), 14, 11, nullptr);
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Debug, "kerr", "dropping redundant event")).Times(1));
     EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Volume.Summary"), SizeIs(2));
 }
@@ -198,7 +198,7 @@ TEST_F(SessionStop, SendsVolumeEventsOnlyOfMoreThanHalfASecond)
         send(from, {{"session_output_running", true}, {"PomoSessionVolume", 0.5}});
         send(to, {{"session_output_running", false}});
     }
-    session->stop();
+    session->stop(platform.turn);
     const auto events = platform.analytics.payloads("com.quarn.kesto.Volume.Summary");
     ASSERT_THAT(events, SizeIs(1));
     EXPECT_EQ(events[0].find("play_seconds")->text(), "0.625");
@@ -219,7 +219,7 @@ TEST_F(SessionStop, NamesAnApplicationThatItDoesNotKnowUnknown)
     session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
     session->start();
     play();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_EQ(*platform.analytics.payloads("com.quarn.kesto.Volume.Summary").at(0).find("HostApplicationDisplayID"),
               Value("Unknown"));
 }
@@ -234,7 +234,7 @@ TEST_F(SessionStop, SaysAndSendsNothingWhenNothingWasRecorded)
 TEST_F(SessionStop, CountsAnewInTheNextRun)
 {
     play();
-    session->stop();
+    session->stop(platform.turn);
     session->start();
     play();
     const auto steps = stop();
@@ -251,7 +251,7 @@ TEST_F(SessionStop, HandsVolumeEventsToTheBridgeEvenWhenThereIsNoMemoryToRecordT
     for (int message = 0; message < 100; ++message)
         send(100, {{"a", message}});
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Volume.Summary"), SizeIs(2));
     EXPECT_THAT(platform.log.lines(),
                 Contains(IsLine(Error, "kerr", "no memory left for the summary of session 42; it is lost")));
@@ -268,7 +268,7 @@ TEST_F(SessionStop, PaysForVolumeEventsFromItsBudgetUntilTheyAreRecorded)
         send(change, {{"PomoSessionVolume", change % 2}});
     ASSERT_LT(budget->taken(), std::size_t{1} << 19);
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     const auto events = platform.analytics.payloads("com.quarn.kesto.Volume.Summary");
     EXPECT_GT(events.size(), 900U);
     EXPECT_THAT(platform.log.lines("keri"),

@@ -115,11 +115,11 @@ TEST_F(SessionTest, HoldsWhatItsClientInstanceKeepsInIt)
     EXPECT_TRUE(session->blinReportingEnabled());
 
     int calls = 0;
-    session->setTransactionCompleteBlock([&](const auto&, bool) { ++calls; });
+    session->setTransactionCompleteBlock([&](auto&, const auto&, bool) { ++calls; });
     session->start();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_EQ(calls, 0) << "the session itself never calls it";
-    session->transactionCompleteBlock()(std::nullopt, true);
+    session->transactionCompleteBlock()(platform.turn, std::nullopt, true);
     EXPECT_EQ(calls, 1);
     session->setTransactionCompleteBlock(nullptr);
     EXPECT_FALSE(session->transactionCompleteBlock());
@@ -231,7 +231,7 @@ TEST_F(SessionTest, KeepsItsConfigurationAndServiceTypeOverRuns)
     session->setConfiguration(Dictionary{{"a", 1}});
     session->start();
     session->updateConfigurationWithContentsOfConfiguration(Dictionary{{"b", 2}});
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_EQ(session->configuration(), (Dictionary{{"a", 1}, {"b", 2}}));
     EXPECT_EQ(session->serviceType(), 4);
     EXPECT_EQ(session->serviceName(), "alarms");
@@ -382,7 +382,7 @@ TEST_F(SessionTest, EndsARunAndDropsWhatItRecorded)
     session->start();
     session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
     forget();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_FALSE(session->started());
     EXPECT_EQ(session->nestedAggregatedPayloadData(), std::nullopt);
     EXPECT_EQ(session->messageIdentifierCounts(), std::nullopt);
@@ -397,12 +397,12 @@ TEST_F(SessionTest, StoppedWithoutAStartOnlySaysSo)
 {
     forget();
     platform.analytics.use("*");
-    session->stop();
+    session->stop(platform.turn);
     session->start();
-    session->stop();
+    session->stop(platform.turn);
     forget();
     platform.analytics.clear();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_FALSE(session->started());
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "ending session 42")));
     EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
@@ -415,7 +415,7 @@ TEST_F(SessionTest, BeginsEveryKindAnewInTheNextRun)
     session->start();
     session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
     session->sendMessage(Dictionary{{"a", 2}}, 4, 1, nullptr);
-    session->stop();
+    session->stop(platform.turn);
     session->start();
     session->sendMessage(Dictionary{{"a", 2}}, 4, 1, nullptr);
     const auto messages = *session->nestedAggregatedPayloadData();
@@ -429,7 +429,7 @@ TEST_F(SessionTest, MarksEveryPointOfItsLifeInOrder)
     session->start();
     session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
     EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(created, started, accepted));
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_EQ(platform.traceMarkers.take().front(), stopping);
     session.reset();
     EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));

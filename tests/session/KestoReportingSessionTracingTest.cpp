@@ -63,7 +63,7 @@ protected:
         EXPECT_EQ(session->traceRunner(), nullptr);
         EXPECT_EQ(tracesStarted(), 0U);
         EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42")));
-        session->stop();
+        session->stop(platform.turn);
         EXPECT_FALSE(session->started());
         EXPECT_EQ(filesWritten(), 0U);
     }
@@ -117,7 +117,7 @@ TEST_F(SessionTracing, ThatIsSetUpInThePlaceOfARunningOneIsNotStarted)
     session->setupTracing(std::string(file));
     EXPECT_FALSE(session->startedTracing());
     EXPECT_EQ(tracesStarted(), 1U);
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_EQ(filesWritten(), 0U) << "there is nothing to stop";
 }
 
@@ -221,7 +221,7 @@ TEST_F(SessionTracing, StartsWithoutIntervalsWhenTheFileCannotBeRead)
     EXPECT_EQ(tracesStarted(), 1U);
     EXPECT_EQ(session->traceParams()->name, "");
     emit(5);
-    session->stop();
+    session->stop(platform.turn);
     ASSERT_EQ(filesWritten(), 1U);
     EXPECT_THAT(platform.performanceWriter.files()[0]->measurements, IsEmpty());
 }
@@ -249,7 +249,7 @@ TEST_F(SessionTracing, DoesNotStartWhenTooManyOthersRunWhichIsSaid)
     EXPECT_THAT(lines(),
                 ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42"),
                             IsLine(Error, "kerr", "session 42 is not traced: 64 others are")));
-    session->stop();
+    session->stop(platform.turn);
 
     others.pop_back();
     session->start();
@@ -272,7 +272,7 @@ TEST_F(SessionTracing, DoesNotStartWithoutAThreadForItWhichIsSaid)
                             IsLine(Debug, "kerr", "Got the tracefile /traces/mix.plist, setting up trace"),
                             IsLine(Error, "kerr", "session 42 is not traced: Resource temporarily unavailable")));
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_FALSE(session->started());
     EXPECT_EQ(filesWritten(), 0U);
     for (const support::LogLine& line : lines())
@@ -290,7 +290,7 @@ TEST_F(SessionTracing, WritesItsResultsWhenTheSessionStops)
     session->start();
     emit(5);
     emit(7);
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_FALSE(session->startedTracing());
     ASSERT_EQ(filesWritten(), 1U);
     const auto& results = *platform.performanceWriter.files()[0];
@@ -314,7 +314,7 @@ TEST_F(SessionTracing, StopsBehindTheSummaryAndBeforeTheMessagesAreDropped)
         if (line.level != Debug)
             steps.push_back(line.message + (session->nestedAggregatedPayloadData() ? "" : " without messages"));
     });
-    session->stop();
+    session->stop(platform.turn);
     platform.log.setObserver(nullptr);
     EXPECT_THAT(steps,
                 ElementsAre("sending summary event for reporter 42", "Tearing down trace :  startup",
@@ -327,7 +327,7 @@ TEST_F(SessionTracing, RunsAnewInEveryRunOfTheSession)
         session->start();
         EXPECT_TRUE(session->startedTracing());
         emit(length);
-        session->stop();
+        session->stop(platform.turn);
     }
     ASSERT_EQ(filesWritten(), 2U);
     EXPECT_EQ(platform.performanceWriter.files()[0]->measurements.at(0).value, 5);
@@ -341,7 +341,7 @@ protected:
     void expectItGoesOn()
     {
         for (int run = 0; run < 2; ++run) {
-            session->stop();
+            session->stop(platform.turn);
             EXPECT_FALSE(session->started());
             EXPECT_TRUE(session->startedTracing());
             EXPECT_FALSE(platform.kernelTrace.sessions()[0]->ended);
@@ -365,7 +365,7 @@ TEST_F(SessionTracingThatIsNotStopped, GoesOnWhenTheFeatureHasBeenSwitchedOffAnd
     platform.featureFlags.disable("Sonalis", "Tracing");
     expectItGoesOn();
     platform.featureFlags.enable("Sonalis", "Tracing");
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_FALSE(session->startedTracing());
     EXPECT_EQ(filesWritten(), 1U);
 }
@@ -376,7 +376,7 @@ TEST_F(SessionTracingThatIsNotStopped, GoesOnWhenTheServiceTypeHasChangedAndStop
     session->setServiceType(3);
     expectItGoesOn();
     session->setServiceType(test);
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_FALSE(session->startedTracing());
     EXPECT_EQ(filesWritten(), 1U);
 }

@@ -103,7 +103,7 @@ TEST_F(SummaryFile, IsNoneWithoutMessages)
 TEST_F(SummaryFile, IsNoneWhileNotStarted)
 {
     record({{"a", 1}});
-    session->stop();
+    session->stop(platform.turn);
     platform.fileSystem.files.clear();
     session->writeSummaryJson();
     EXPECT_THAT(platform.fileSystem.files, IsEmpty());
@@ -114,7 +114,7 @@ TEST_F(SummaryFile, IsNoneOfASessionThatWasNeverStarted)
     session = std::make_shared<KestoReportingSession>(43, std::vector<std::int32_t>{7});
     record({{"a", 1}});
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     session->writeSummaryJson();
     EXPECT_THAT(platform.fileSystem.files, IsEmpty());
     EXPECT_THAT(platform.fileSystem.directories, IsEmpty());
@@ -128,7 +128,7 @@ TEST(SummaryFileOnCustomerBuilds, IsNone)
     session->start();
     session->sendMessage(Dictionary{{"a", 1}}, playback, 1, nullptr);
     session->writeSummaryJson();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_THAT(platform.fileSystem.files, IsEmpty());
     EXPECT_THAT(platform.fileSystem.directories, IsEmpty());
 }
@@ -151,14 +151,14 @@ TEST_F(SummaryFile, IsInADirectoryForEverybody)
 TEST_F(SummaryFile, TakesThePlaceOfAnEarlierOneOfTheSameSecond)
 {
     record({{"a", 1}});
-    session->stop();
+    session->stop(platform.turn);
     platform.clock.advance(0.2);
     const auto other = std::make_shared<KestoReportingSession>(43, std::vector<std::int32_t>{7});
     other->setServiceType(7);
     other->setConfiguration(Dictionary{{"HostApplicationDisplayID", "org.player"}});
     other->start();
     other->sendMessage(Dictionary{{"b", 2}}, playback, 1, nullptr);
-    other->stop();
+    other->stop(platform.turn);
     ASSERT_THAT(platform.fileSystem.files, SizeIs(1));
     EXPECT_THAT(platform.fileSystem.files.begin()->second, testing::HasSubstr("\"b\": 2"));
 }
@@ -451,7 +451,7 @@ TEST_F(SummaryFile, DoesNotKeepASessionFromStopping)
     platform.fileSystem.directoryError = std::make_error_code(std::errc::permission_denied);
     record({{"a", std::numeric_limits<double>::quiet_NaN()}});
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_FALSE(session->started());
     EXPECT_THAT(platform.log.lines("kerr"), Contains(IsLine(Default, "kerr", "sending summary event for reporter 42")));
 }

@@ -57,7 +57,7 @@ TEST_F(Summary, IsNothingWithoutMessages)
 TEST_F(Summary, IsNothingWhileNotStarted)
 {
     record({{"a", 1}});
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_EQ(session->createSummaryEventForSession(), std::nullopt);
 }
 
@@ -155,7 +155,7 @@ TEST(SummaryOnCustomerBuilds, IsMadeAndRecordedWithoutTimeStamps)
     std::vector<std::string> recorded;
     platform.traceMarkers.setObserver(
         [&](std::uint32_t) { recorded = textsOf(*session->nestedAggregatedPayloadData()); });
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_THAT(recorded,
                 testing::ElementsAre(R"({"Playback_Start_1":{"a":1,"audiotag":"PlaybackStart"}})",
                                      R"({"Undefined_Unknown_1":{"KESTO_Session_Summary_Event":"0","a":"1",)"
@@ -182,7 +182,7 @@ TEST(SummaryOfManyValues, IsLostWhenTheBudgetHasNoRoomForIt)
     EXPECT_EQ(budget->taken(), taken) << "what was gathered is paid back";
 
     platform.log.clear();
-    session->stop();
+    session->stop(platform.turn);
     using support::IsLine;
     using enum platform::LogLevel;
     EXPECT_THAT(platform.log.lines(),
@@ -252,7 +252,7 @@ RC_GTEST_PROP(SummaryOfAnyStore, IsWhatItsDefinitionMakesOfIt, ())
         RC_ASSERT(summary.has_value() == expected.has_value());
         if (summary)
             RC_ASSERT(Value(*summary).text() == Value(*expected).text());
-        session->stop();
+        session->stop(platform.turn);
     }
 }
 

@@ -26,7 +26,7 @@ class FennicBridgeTest : public testing::Test {
 protected:
     void send(const Dictionary& message, AudioEventCategory category = 4, AudioEventType type = 1)
     {
-        KestoReportingFennicBridge::handleEvent(message, category, type, session);
+        KestoReportingFennicBridge::handleEvent(platform.turn, message, category, type, session);
     }
 
     support::TestPlatform platform;

@@ -7,10 +7,10 @@
 #pragma once
 
 #include "client/KestoReportingClientServerInstance.h"
-#include "client/KestoReportingServerQueue.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "support/TestPlatform.h"
 #include "support/fakes/FakeConnection.h"
+#include "utility/KestoReportingServerQueue.h"
 
 #include <cstdint>
 #include <functional>
@@ -49,12 +49,18 @@ inline Answers answeredOnce(foundation::Array answer)
 }
 inline const Answers unanswered;
 
-// What the work returns, done where the service does whatever touches clients and sessions.
-template <typename Work> std::invoke_result_t<Work> onServerQueue(FakeWorkQueues& queues, Work work)
+// What the work returns, done in a turn of the server queue.
+template <typename Work> auto onServerQueue(FakeWorkQueues& queues, Work work)
 {
-    std::packaged_task<std::invoke_result_t<Work>()> task(std::move(work));
+    auto inTurn = [&work](platform::Turn& turn) {
+        if constexpr (std::is_invocable_v<Work, platform::Turn&>)
+            return work(turn);
+        else
+            return work();
+    };
+    std::packaged_task<std::invoke_result_t<decltype(inTurn), platform::Turn&>(platform::Turn&)> task(inTurn);
     auto result = task.get_future();
-    KestoReportingServerQueue()->submit([&task] { task(); });
+    KestoReportingServerQueue()->submit([&task](platform::Turn& turn) { task(turn); });
     queues.runAll();
     return result.get();
 }

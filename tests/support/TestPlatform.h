@@ -28,6 +28,7 @@ public:
     FakeLog log;
     FakeClock clock;
     FakeWorkQueues workQueues{clock};
+    platform::Turn turn; // for what is called from no queue; nothing that it gathers goes anywhere
     FakePreferences preferences;
     FakeFeatureFlags featureFlags;
     FakeDeviceProperties deviceProperties;

@@ -4,7 +4,6 @@
 namespace {
 
 using enum platform::LogLevel;
-using platform::QualityOfService;
 using support::eventOf;
 using support::IsLine;
 using support::measurement;
@@ -23,7 +22,7 @@ TEST_F(Runner, IsMadeWithoutTracesAndWithAQueueOfItsOwn)
     EXPECT_EQ(TraceRunner::resultsFileName, "tracing_results.qdj");
     EXPECT_EQ(TraceRunner::projectName, "KestoReporting");
     EXPECT_THAT(platform.workQueues.made(),
-                ElementsAre(support::FakeWorkQueues::MadeQueue{"Tracing Queue", QualityOfService::Default}));
+                ElementsAre(support::FakeWorkQueues::MadeQueue{"Tracing Queue", {}, false}));
     EXPECT_THAT(platform.log.lines(), IsEmpty());
 }
 

@@ -2,8 +2,6 @@
 // happens at the end of a turn.
 #include "platform/linux/LinuxPlatform.h"
 
-#include "platform/linux/connection/Outbox.h"
-
 namespace platform {
 namespace {
 
@@ -43,7 +41,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
 {
     preferences_.setChangeHandler([this](std::string_view domain) { notifications_.post(notificationOf(domain)); });
     // The replies of a turn leave once its events are kept.
-    workQueues_.setTurnEndHandler([this] { analytics_.endTurn(Outbox::endTurn()); });
+    workQueues_.setTurnEndHandler([this](Turn& turn) { analytics_.endTurn(turn, turn.letters.take()); });
 }
 
 Platform LinuxPlatform::platform()

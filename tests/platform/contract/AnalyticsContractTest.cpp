@@ -31,6 +31,8 @@ public:
     // From now on some consumer wants events of such names, which are globs; nobody wants any at first. It takes effect
     // a moment later.
     virtual void use(const std::string& pattern) = 0;
+    // What the platform does when a turn is over.
+    virtual void end(platform::Turn&) { }
     // The events that were kept, in order; the service has ended then.
     [[nodiscard]] virtual std::vector<AnalyticsEvent> events() = 0;
 };
@@ -60,6 +62,7 @@ public:
         patterns_ += (patterns_.empty() ? "\"" : ", \"") + pattern + '"';
         configure();
     }
+    void end(platform::Turn& turn) override { store_->endTurn(turn, nullptr); }
     [[nodiscard]] std::vector<AnalyticsEvent> events() override
     {
         store_.reset(); // which keeps all of them
@@ -93,7 +96,8 @@ protected:
     }
     void send(const std::string& name, Dictionary payload)
     {
-        subject->analytics().sendAnalyticsEventLazy(name, [payload = std::move(payload)] { return payload; });
+        subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, name,
+                                                    [payload = std::move(payload)] { return payload; });
     }
 };
 KESTO_CONTRACT(AnalyticsContract, (provider<AnalyticsSubject, FakeAnalyticsSubject>("Fake")),
@@ -125,13 +129,27 @@ TEST_P(AnalyticsContract, KeepsEventsInTheOrderInWhichTheyWereSent)
                             AnalyticsEvent{"com.quarn.a", {{"n", 2}}}));
 }
 
+TEST_P(AnalyticsContract, KeepsTheEventsOfATurnInTheirOrderOnceItIsOver)
+{
+    want("com.quarn.a");
+    platform::Turn turn;
+    for (int number = 1; number <= 3; ++number)
+        subject->analytics().sendAnalyticsEventLazy(turn, "com.quarn.a",
+                                                    [number] { return Dictionary{{"n", number}}; });
+    subject->end(turn);
+    send("com.quarn.a", {{"n", 4}});
+    EXPECT_THAT(subject->events(),
+                ElementsAre(AnalyticsEvent{"com.quarn.a", {{"n", 1}}}, AnalyticsEvent{"com.quarn.a", {{"n", 2}}},
+                            AnalyticsEvent{"com.quarn.a", {{"n", 3}}}, AnalyticsEvent{"com.quarn.a", {{"n", 4}}}));
+}
+
 TEST_P(AnalyticsContract, BuildsAPayloadOnceAndLetsItsBuilderGo)
 {
     want("com.quarn.a");
     int built = 0;
     auto held = std::make_shared<int>(7);
     const std::weak_ptr<int> watched = held;
-    subject->analytics().sendAnalyticsEventLazy("com.quarn.a", [&built, held = std::move(held)] {
+    subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, "com.quarn.a", [&built, held = std::move(held)] {
         ++built;
         return Dictionary{{"n", *held}};
     });
@@ -147,7 +165,7 @@ TEST_P(AnalyticsContract, DropsAnEventThatNobodyWantsWithItsBuilder)
     want("com.quarn.a");
     auto held = std::make_shared<int>(7);
     const std::weak_ptr<int> watched = held;
-    subject->analytics().sendAnalyticsEventLazy("com.quarn.b", [held = std::move(held)] {
+    subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, "com.quarn.b", [held = std::move(held)] {
         ADD_FAILURE() << "nobody needs the payload";
         return Dictionary{{"n", *held}};
     });

@@ -3,7 +3,6 @@
 #include "platform/contract/Contract.h"
 #include "platform/linux/connection/ConnectionClient.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
-#include "platform/linux/connection/Outbox.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeConnection.h"
@@ -66,7 +65,7 @@ public:
     // The number of the process that the peers are.
     [[nodiscard]] virtual std::int32_t peerProcess() const = 0;
     // A queue whose turns end as the service's do.
-    [[nodiscard]] virtual platform::WorkQueue& serverQueue() = 0;
+    [[nodiscard]] virtual platform::TurnQueue& serverQueue() = 0;
     // Does what waits, if nobody else does.
     virtual void work() { }
 };
@@ -104,7 +103,7 @@ public:
         return std::make_unique<FakePeer>(connections_.back());
     }
     [[nodiscard]] std::int32_t peerProcess() const override { return 1001; }
-    [[nodiscard]] platform::WorkQueue& serverQueue() override { return *queue_; }
+    [[nodiscard]] platform::TurnQueue& serverQueue() override { return *queue_; }
     void work() override
     {
         queues_.runAll();
@@ -115,8 +114,7 @@ public:
 private:
     support::FakeClock clock_;
     support::FakeWorkQueues queues_{clock_};
-    std::shared_ptr<platform::WorkQueue> queue_ =
-        queues_.makeSerialQueue("server", platform::QualityOfService::UserInteractive);
+    std::shared_ptr<platform::TurnQueue> queue_ = queues_.makeTurnQueue("server", {.mayBeHelped = true});
     support::FakeConnectionListener listener_;
     std::vector<std::shared_ptr<support::FakeConnection>> connections_;
 };
@@ -168,11 +166,11 @@ class LinuxConnectionSubject final : public ConnectionSubject {
 public:
     LinuxConnectionSubject()
     {
-        queues_.setTurnEndHandler([] {
-            if (auto send = platform::Outbox::endTurn())
+        queues_.setTurnEndHandler([](platform::Turn& turn) {
+            if (auto send = turn.letters.take())
                 send();
         });
-        queue_ = queues_.makeSerialQueue("server", platform::QualityOfService::UserInteractive);
+        queue_ = queues_.makeTurnQueue("server", {.mayBeHelped = true});
         // Both ends of every connection are in this process: its limit stays as it is.
         listener_ =
             platform::LinuxConnectionListener::create(platform::ListeningSocket::bind(path_).value(), log_).value();
@@ -195,7 +193,7 @@ public:
     }
     [[nodiscard]] std::unique_ptr<Peer> connect() override { return std::make_unique<LinuxPeer>(path_); }
     [[nodiscard]] std::int32_t peerProcess() const override { return ::getpid(); }
-    [[nodiscard]] platform::WorkQueue& serverQueue() override { return *queue_; }
+    [[nodiscard]] platform::TurnQueue& serverQueue() override { return *queue_; }
 
 private:
     static inline constinit platform::LogCategory log_{"com.quarn.kesto", "kerc"};
@@ -203,7 +201,7 @@ private:
     const support::TemporaryDirectory directory_;
     const std::filesystem::path path_ = directory_ / "socket";
     platform::LinuxWorkQueues queues_;
-    std::shared_ptr<platform::WorkQueue> queue_;
+    std::shared_ptr<platform::TurnQueue> queue_;
     std::unique_ptr<platform::LinuxConnectionListener> listener_;
     std::thread thread_;
 };
@@ -356,7 +354,7 @@ TEST_P(ConnectionContract, CarriesAnswersBackInTheirOrderWheneverTheyAreGiven)
 {
     onCall = [](Record& record, const Connection::Call& call) {
         if (numberOf(call.frame) == 1)
-            record.connection->send(answer(1));
+            support::sendAtOnce(*record.connection, answer(1));
         return Outcome();
     };
     const auto [peer, record] = listenAndConnect();
@@ -365,8 +363,8 @@ TEST_P(ConnectionContract, CarriesAnswersBackInTheirOrderWheneverTheyAreGiven)
     ASSERT_THAT(historyOnceItHas(3, *record), SizeIs(3));
     EXPECT_FALSE(peer->hasAnswer());
     std::jthread([&connection = *record->connection] { // from any thread
-        connection.send(answer(3));
-        connection.send(answer(2));
+        support::sendAtOnce(connection, answer(3));
+        support::sendAtOnce(connection, answer(2));
     })
         .join();
     EXPECT_EQ(peer->nextAnswer(), 3);
@@ -400,9 +398,9 @@ TEST_P(ConnectionContract, SendsTheAnswersOfATurnWhenTheTurnIsOver)
 {
     const auto [peer, record] = listenAndConnect();
     bool hasArrivedBefore = false;
-    subject->serverQueue().submit([&, &made = *record, &other = *peer] {
-        made.connection->send(answer(1));
-        made.connection->send(answer(2));
+    subject->serverQueue().submit([&, &made = *record, &other = *peer](platform::Turn& turn) {
+        made.connection->send(turn, answer(1));
+        made.connection->send(turn, answer(2));
         hasArrivedBefore = other.hasAnswer();
         note(made, "turn");
     });
@@ -417,7 +415,7 @@ TEST_P(ConnectionContract, SendsWithoutWaitingForAPeerThatDoesNotRead)
     constexpr int count = 100;
     const auto [peer, record] = listenAndConnect();
     for (int number = 1; number <= count; ++number) // far more than a socket holds
-        record->connection->send(support::answerTo({number}, 64 * 1024));
+        support::sendAtOnce(*record->connection, support::answerTo({number}, 64 * 1024));
     for (int number = 1; number <= count; ++number)
         ASSERT_EQ(peer->nextAnswer(), number);
 }
@@ -512,7 +510,7 @@ TEST_P(ConnectionContract, EndsForItselfAlone)
     ASSERT_TRUE(waitForEnd(*badRecord));
     good->call({callOf(1)});
     EXPECT_THAT(historyOnceItHas(1, *goodRecord), ElementsAre("call 1"));
-    goodRecord->connection->send(answer(1));
+    support::sendAtOnce(*goodRecord->connection, answer(1));
     EXPECT_EQ(good->nextAnswer(), 1);
 }
 
@@ -544,19 +542,19 @@ TEST_P(ConnectionContract, HoldsItsHandlersUntilTheInvalidationHandlerHasReturne
 TEST_P(ConnectionContract, DropsWhatIsSentOnceItIsBroken)
 {
     onCall = [](Record&, const Connection::Call&) { return std::unexpected(Connection::Violation{"none is allowed"}); };
-    onEnd = [](Record& record, std::string_view) { record.connection->send(answer(1)); };
+    onEnd = [](Record& record, std::string_view) { support::sendAtOnce(*record.connection, answer(1)); };
     const auto [peer, record] = listenAndConnect();
     peer->call({callOf(1)});
     ASSERT_TRUE(waitForEnd(*record));
-    record->connection->send(answer(2));
+    support::sendAtOnce(*record->connection, answer(2));
     EXPECT_EQ(peer->nextAnswer(), std::nullopt);
 }
 
 TEST_P(ConnectionContract, DropsTheAnswersOfATurnThatItDoesNotOutlive)
 {
     const auto [peer, record] = listenAndConnect();
-    subject->serverQueue().submit([this, &made = *record] {
-        made.connection->send(answer(1));
+    subject->serverQueue().submit([this, &made = *record](platform::Turn& turn) {
+        made.connection->send(turn, answer(1));
         subject->stop();
         note(made, "turn");
     });
@@ -571,7 +569,7 @@ TEST_P(ConnectionContract, LetsACallOutliveIt)
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
     ASSERT_THAT(record->calls, SizeIs(1));
-    record->calls[0].caller->send(answer(1)); // which nobody reads
+    support::sendAtOnce(*record->calls[0].caller, answer(1)); // which nobody reads
     const std::weak_ptr<Connection> connection = record->connection;
     record->connection.reset();
     EXPECT_FALSE(connection.expired()) << "whoever works on a call has its caller";
@@ -612,7 +610,7 @@ TEST_P(ConnectionContract, IsOfOneOfSeveralPeersOfOneProcess)
     second->call({callOf(2)});
     EXPECT_THAT(historyOnceItHas(1, *firstRecord), ElementsAre("call 1"));
     EXPECT_THAT(historyOnceItHas(1, *secondRecord), ElementsAre("call 2"));
-    secondRecord->connection->send(answer(2));
+    support::sendAtOnce(*secondRecord->connection, answer(2));
     EXPECT_EQ(second->nextAnswer(), 2);
     EXPECT_FALSE(first->hasAnswer());
 }

@@ -143,7 +143,7 @@ class Listener {
 public:
     explicit Listener(KernelTraceSubject& subject)
         : subject_(subject),
-          queue(subject.queues().makeSerialQueue("trace", platform::QualityOfService::Default)),
+          queue(subject.queues().makeSerialQueue("trace", {})),
           session(subject.trace().createTraceSession())
     {
         delivered_.listenTo(*session, *queue);
@@ -318,7 +318,7 @@ TEST_P(KernelTraceContract, TellsInTheCompletionHandlerHowManyEventsWereLostWhil
 {
     support::Progress progress;
     std::vector<std::uint64_t> lost;
-    const auto queue = subject->queues().makeSerialQueue("trace", platform::QualityOfService::Default);
+    const auto queue = subject->queues().makeSerialQueue("trace", {});
     const auto run = [&](bool isLosing) {
         const std::size_t before = lost.size();
         const auto session = subject->trace().createTraceSession();
@@ -420,7 +420,7 @@ TEST_P(KernelTraceContract, LetsACompletionHandlerDestroyItsSession)
 {
     support::Progress progress;
     bool isDone = false;
-    const auto queue = subject->queues().makeSerialQueue("trace", platform::QualityOfService::Default);
+    const auto queue = subject->queues().makeSerialQueue("trace", {});
     std::unique_ptr<KernelTraceSession> session = subject->trace().createTraceSession();
     session->setCompletionHandler([&] {
         session.reset();
@@ -437,7 +437,7 @@ TEST_P(KernelTraceContract, HoldsNothingOfASessionThatIsGone)
 {
     auto held = std::make_shared<int>(7);
     const std::weak_ptr<int> watched = held;
-    const auto queue = subject->queues().makeSerialQueue("trace", platform::QualityOfService::Default);
+    const auto queue = subject->queues().makeSerialQueue("trace", {});
     {
         const auto session = subject->trace().createTraceSession();
         session->setCompletionHandler([held] { });

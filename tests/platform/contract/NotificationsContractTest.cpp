@@ -136,8 +136,7 @@ protected:
         ASSERT_TRUE(fence.waitForMoreThan(0));
     }
 
-    std::shared_ptr<platform::WorkQueue> queue =
-        subject->queues().makeSerialQueue("test", platform::QualityOfService::Default);
+    std::shared_ptr<platform::WorkQueue> queue = subject->queues().makeSerialQueue("test", {});
 };
 KESTO_CONTRACT(NotificationsContract, (provider<NotificationsSubject, FakeNotificationsSubject>("Fake")),
                (provider<NotificationsSubject, LinuxNotificationsSubject>("Linux")));

@@ -65,7 +65,7 @@ class WorkQueuesContract : public Suite<WorkQueuesSubject> {
 protected:
     std::shared_ptr<WorkQueue> makeQueue(QualityOfService quality = QualityOfService::Default)
     {
-        return subject->queues().makeSerialQueue("com.quarn.kesto.test", quality);
+        return subject->queues().makeSerialQueue("com.quarn.kesto.test", {.quality = quality});
     }
     void note(const std::string& what)
     {

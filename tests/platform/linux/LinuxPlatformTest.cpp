@@ -82,10 +82,11 @@ TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)
 {
     LinuxPlatform providers(launch());
     const Platform platform = providers.platform();
-    const auto queue = platform.workQueues.makeSerialQueue("com.quarn.kesto.test", QualityOfService::UserInteractive);
+    const auto queue = platform.workQueues.makeTurnQueue("com.quarn.kesto.test", {});
     std::promise<void> sent;
-    queue->submit([&] {
-        platform.analytics.sendAnalyticsEventLazy("com.quarn.kesto.test", [] { return foundation::Dictionary(); });
+    queue->submit([&](Turn& turn) {
+        platform.analytics.sendAnalyticsEventLazy(turn, "com.quarn.kesto.test",
+                                                  [] { return foundation::Dictionary(); });
         sent.set_value();
     });
     sent.get_future().wait();
@@ -114,7 +115,7 @@ TEST_F(LinuxPlatformTest, WhatWasSentIsKeptWhenThePlatformEnds)
 {
     {
         LinuxPlatform providers(launch());
-        providers.platform().analytics.sendAnalyticsEventLazy("com.quarn.kesto.test",
+        providers.platform().analytics.sendAnalyticsEventLazy(outsideTurn, "com.quarn.kesto.test",
                                                               [] { return foundation::Dictionary(); });
     }
     EXPECT_EQ(support::StoreReader(directory.path() / "state" / "analytics.sqlite3").eventCount(), 1);

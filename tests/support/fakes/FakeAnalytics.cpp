@@ -101,7 +101,14 @@ bool FakeAnalytics::isUsed(const std::string& name) const
                                [&](const auto& pattern) { return fnmatch(pattern.c_str(), name.c_str(), 0) == 0; });
 }
 
-void FakeAnalytics::sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder)
+// Events are there at once: what a turn delays is for those to test that keep them.
+void FakeAnalytics::sendAnalyticsEventLazy(platform::Turn&, std::string_view eventName, PayloadBuilder payloadBuilder)
+{
+    sendAnalyticsEventLazy(platform::outsideTurn, eventName, std::move(payloadBuilder));
+}
+
+void FakeAnalytics::sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view eventName,
+                                           PayloadBuilder payloadBuilder)
 {
     std::string name(eventName);
     const foundation::Lock lock(lock_);

@@ -45,7 +45,10 @@ public:
     void clear();
 
     bool isAnalyticsEventUsed(std::string_view eventName) override;
-    void sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder) override;
+    void sendAnalyticsEventLazy(platform::Turn& turn, std::string_view eventName,
+                                PayloadBuilder payloadBuilder) override;
+    void sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view eventName,
+                                PayloadBuilder payloadBuilder) override;
 
 private:
     struct Sent {

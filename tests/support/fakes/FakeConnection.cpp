@@ -1,7 +1,7 @@
 // The rules that a real connection keeps are expectations here: no call before reading begins, none after the end.
 #include "support/fakes/FakeConnection.h"
 
-#include "support/fakes/FakeWorkQueues.h"
+#include "platform/linux/connection/FrameReader.h"
 
 #include <gtest/gtest.h>
 #include <utility>
@@ -117,16 +117,23 @@ std::string FakeConnection::description() const
     return "connection of process " + std::to_string(processIdentifier_);
 }
 
-void FakeConnection::send(std::string frame)
+void FakeConnection::send(platform::Turn& turn, std::string frame)
 {
     ++sent_;
-    FakeWorkQueues::afterTurn([self = shared_from_this(), frame = std::move(frame)] {
-        if (!self->isInterrupted_ && !self->isOver_)
-            self->received_.push_back(self->decoded(frame));
-    });
+    platform::appendFrame(frame, turn.letters.to(*this));
 }
 
-Array FakeConnection::decoded(const std::string& frame)
+void FakeConnection::write(std::string letter)
+{
+    if (isInterrupted_ || isOver_)
+        return;
+    platform::FrameReader reader;
+    reader.feed(letter);
+    for (auto frame = reader.next(); frame && *frame; frame = reader.next())
+        received_.push_back(decoded(**frame));
+}
+
+Array FakeConnection::decoded(std::string_view frame)
 {
     const auto value = decoder_.decode(frame);
     EXPECT_TRUE(value && value->array()) << "a frame is an array";

@@ -54,12 +54,13 @@ public:
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
     // All handlers are installed before.
     void resume() override;
-    void send(std::string frame) override;
+    void send(platform::Turn& turn, std::string frame) override;
+    void write(std::string letter) override;
 
 private:
     class Credit;
 
-    [[nodiscard]] foundation::Array decoded(const std::string& frame);
+    [[nodiscard]] foundation::Array decoded(std::string_view frame);
     [[nodiscard]] bool isBehind() const;
     [[nodiscard]] std::expected<void, Violation> deliverNext();
     void deliverWhatIsLeft();

@@ -2,6 +2,8 @@
 // the background queue no more than the few that its threads could.
 #include "support/fakes/FakeWorkQueues.h"
 
+#include "platform/Turn.h"
+
 #include <algorithm>
 #include <stdexcept>
 #include <system_error>
@@ -10,24 +12,18 @@
 namespace support {
 
 namespace {
-
 constexpr std::ptrdiff_t mostBackgroundThreads = 4;
+}
 
-// What waits for the end of the turn that this thread runs; null while it runs none.
-thread_local std::vector<platform::WorkItem>* afterThisTurn = nullptr;
-
-} // namespace
-
-class FakeWorkQueues::Queue final : public platform::WorkQueue, public std::enable_shared_from_this<Queue> {
+class FakeWorkQueues::Queue final : public platform::TurnQueue, public std::enable_shared_from_this<Queue> {
 public:
-    Queue(FakeWorkQueues& queues, std::ptrdiff_t mostAtOnce, bool hasTurns)
-        : queues_(queues),
-          mostAtOnce_(mostAtOnce),
-          hasTurns_(hasTurns)
-    {
-    }
+    Queue(FakeWorkQueues& queues, std::ptrdiff_t mostAtOnce) : queues_(queues), mostAtOnce_(mostAtOnce) { }
 
-    void submit(platform::WorkItem item) override { queues_.items_.push_back({shared_from_this(), std::move(item)}); }
+    void submit(platform::WorkItem item) override
+    {
+        submit([item = std::move(item)](platform::Turn&) mutable { item(); });
+    }
+    void submit(platform::TurnItem item) override { queues_.items_.push_back({shared_from_this(), std::move(item)}); }
 
     [[nodiscard]] bool isCurrent() const override
     {
@@ -35,34 +31,22 @@ public:
     }
 
     [[nodiscard]] bool mayRun() const { return std::ranges::count(queues_.running_, this) < mostAtOnce_; }
-    [[nodiscard]] bool hasTurns() const { return hasTurns_; }
 
 private:
     FakeWorkQueues& queues_;
     const std::ptrdiff_t mostAtOnce_;
-    const bool hasTurns_;
 };
 
 // While it lives, an item of the queue runs, and inside of it perhaps others.
 class FakeWorkQueues::Run {
 public:
-    Run(FakeWorkQueues& queues, Queue& queue, std::vector<platform::WorkItem>& whenOver)
-        : queues_(queues),
-          outerTurn_(std::exchange(afterThisTurn, queue.hasTurns() ? &whenOver : nullptr))
-    {
-        queues_.running_.push_back(&queue);
-    }
-    ~Run()
-    {
-        queues_.running_.pop_back();
-        afterThisTurn = outerTurn_;
-    }
+    Run(FakeWorkQueues& queues, Queue& queue) : queues_(queues) { queues_.running_.push_back(&queue); }
+    ~Run() { queues_.running_.pop_back(); }
     Run(const Run&) = delete;
     Run& operator=(const Run&) = delete;
 
 private:
     FakeWorkQueues& queues_;
-    std::vector<platform::WorkItem>* const outerTurn_;
 };
 
 namespace {
@@ -89,7 +73,7 @@ private:
 
 FakeWorkQueues::FakeWorkQueues(FakeClock& clock)
     : clock_(clock),
-      background_(std::make_shared<Queue>(*this, mostBackgroundThreads, false))
+      background_(std::make_shared<Queue>(*this, mostBackgroundThreads))
 {
 }
 
@@ -107,23 +91,15 @@ bool FakeWorkQueues::runOne()
         return false;
     Item item = std::move(*next);
     items_.erase(next);
-    std::vector<platform::WorkItem> whenOver;
+    platform::Turn turn;
     {
-        const Run run(*this, *item.queue, whenOver);
-        item.work();
+        const Run run(*this, *item.queue);
+        item.work(turn);
         item.work = nullptr; // what it holds is let go of on its queue
     }
-    for (platform::WorkItem& each : whenOver)
-        each();
+    if (auto send = turn.letters.take())
+        send();
     return true;
-}
-
-void FakeWorkQueues::afterTurn(platform::WorkItem item)
-{
-    if (afterThisTurn != nullptr)
-        afterThisTurn->push_back(std::move(item));
-    else
-        item();
 }
 
 void FakeWorkQueues::advance(std::chrono::nanoseconds duration)
@@ -160,13 +136,24 @@ std::vector<const platform::WorkQueue*> FakeWorkQueues::delayed() const
     return queues;
 }
 
-std::shared_ptr<platform::WorkQueue> FakeWorkQueues::makeSerialQueue(std::string_view name,
-                                                                     platform::QualityOfService quality)
+std::shared_ptr<FakeWorkQueues::Queue> FakeWorkQueues::make(const MadeQueue& queue)
 {
     if (!hasThreads)
         throw std::system_error(std::make_error_code(std::errc::resource_unavailable_try_again));
-    made_.push_back({std::string(name), quality});
-    return std::make_shared<Queue>(*this, 1, quality == platform::QualityOfService::UserInteractive);
+    made_.push_back(queue);
+    return std::make_shared<Queue>(*this, 1);
+}
+
+std::shared_ptr<platform::WorkQueue> FakeWorkQueues::makeSerialQueue(std::string_view name,
+                                                                     platform::SerialQueueOptions options)
+{
+    return make({std::string(name), options, false});
+}
+
+std::shared_ptr<platform::TurnQueue> FakeWorkQueues::makeTurnQueue(std::string_view name,
+                                                                   platform::SerialQueueOptions options)
+{
+    return make({std::string(name), options, true});
 }
 
 platform::WorkQueue& FakeWorkQueues::backgroundQueue()

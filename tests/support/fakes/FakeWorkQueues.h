@@ -2,7 +2,7 @@
 // which it was submitted, and delayed work when virtual time reaches it.
 //
 // What a real serial queue promises holds here too: while one of its items waits for a semaphore, other queues
-// go on and this one does not. Each item of an interactive queue is a turn.
+// go on and this one does not. Each item is a turn of its own, and what it sent leaves behind it.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -20,7 +20,8 @@ class FakeWorkQueues final : public platform::WorkQueues {
 public:
     struct MadeQueue {
         std::string name;
-        platform::QualityOfService quality;
+        platform::SerialQueueOptions options;
+        bool hasTurns = false;
         friend bool operator==(const MadeQueue&, const MadeQueue&) = default;
     };
 
@@ -41,9 +42,6 @@ public:
     // Drops what has not run.
     void discardAll();
 
-    // Runs the item when the turn that the calling thread runs is over, or here and now where it runs none.
-    static void afterTurn(platform::WorkItem item);
-
     // How many items wait to be run.
     [[nodiscard]] std::size_t pending() const { return items_.size(); }
     // The queues of the items that wait for their time, in the order of time.
@@ -53,7 +51,9 @@ public:
 
     // Throws as a thread does that cannot be started.
     std::shared_ptr<platform::WorkQueue> makeSerialQueue(std::string_view name,
-                                                         platform::QualityOfService quality) override;
+                                                         platform::SerialQueueOptions options) override;
+    std::shared_ptr<platform::TurnQueue> makeTurnQueue(std::string_view name,
+                                                       platform::SerialQueueOptions options) override;
     platform::WorkQueue& backgroundQueue() override;
     void submitAfter(std::chrono::nanoseconds delay, platform::WorkQueue& queue, platform::WorkItem item) override;
     // Waiting for it runs other work, and throws std::logic_error when that cannot help.
@@ -64,13 +64,14 @@ private:
     class Run;
     struct Item {
         std::shared_ptr<Queue> queue;
-        platform::WorkItem work;
+        platform::TurnItem work;
     };
     struct DelayedItem {
         std::chrono::nanoseconds due;
         platform::WorkQueue* queue;
         platform::WorkItem work;
     };
+    std::shared_ptr<Queue> make(const MadeQueue& queue);
     void moveTo(std::chrono::nanoseconds moment);
 
     FakeClock& clock_;

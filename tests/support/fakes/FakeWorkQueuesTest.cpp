@@ -1,13 +1,14 @@
 // The work queues of the tests are worth as much as they resemble real ones.
 #include "support/fakes/FakeWorkQueues.h"
 
+#include "support/fakes/FakeConnection.h"
+
 #include <gmock/gmock.h>
 #include <stdexcept>
 
 namespace {
 
 using namespace std::chrono_literals;
-using platform::QualityOfService;
 using testing::ElementsAre;
 
 class FakeWorkQueuesTest : public testing::Test {
@@ -19,8 +20,8 @@ protected:
 
     support::FakeClock clock;
     support::FakeWorkQueues queues{clock};
-    std::shared_ptr<platform::WorkQueue> serial = queues.makeSerialQueue("one", QualityOfService::UserInteractive);
-    std::shared_ptr<platform::WorkQueue> other = queues.makeSerialQueue("two", QualityOfService::Default);
+    std::shared_ptr<platform::TurnQueue> serial = queues.makeTurnQueue("one", {});
+    std::shared_ptr<platform::WorkQueue> other = queues.makeSerialQueue("two", {});
     std::vector<std::string> noted;
 };
 
@@ -73,20 +74,20 @@ TEST_F(FakeWorkQueuesTest, ABackgroundItemThatWaitsForMoreOthersThanThereAreThre
     EXPECT_THROW(queues.runAll(), std::logic_error) << "the fifth does not run beside four";
 }
 
-TEST_F(FakeWorkQueuesTest, EachItemOfAnInteractiveQueueIsATurnAndNoOtherIs)
+TEST_F(FakeWorkQueuesTest, EachItemIsATurnWhoseLettersLeaveBeforeTheNextRuns)
 {
-    const auto sending = [this](std::string what) {
-        return [this, what = std::move(what)] {
-            support::FakeWorkQueues::afterTurn(noting("after " + what));
-            noted.push_back(what);
-        };
+    const auto connection = std::make_shared<support::FakeConnection>(1001);
+    const auto sendAndCount = [&](platform::Turn& turn) {
+        std::string frame;
+        foundation::appendCbor(foundation::Value(foundation::Array{1}), frame);
+        connection->send(turn, std::move(frame));
+        noted.push_back(std::to_string(connection->received().size()));
     };
-    serial->submit(sending("turn"));
-    serial->submit(noting("next"));
-    other->submit(sending("other"));
+    serial->submit(sendAndCount);
+    serial->submit(sendAndCount);
     queues.runAll();
-    sending("here")();
-    EXPECT_THAT(noted, ElementsAre("turn", "after turn", "next", "after other", "other", "after here", "here"));
+    EXPECT_THAT(noted, ElementsAre("0", "1"));
+    EXPECT_EQ(connection->received().size(), 2U);
 }
 
 TEST_F(FakeWorkQueuesTest, AWaitThatWouldNeverEndIsAnError)

@@ -4,9 +4,7 @@
 
 #include "foundation/cbor/Cbor.h"
 #include "platform/linux/connection/FrameReader.h"
-#include "platform/linux/connection/Outbox.h"
 #include "platform/linux/files/SystemError.h"
-#include "platform/linux/queues/SerialQueue.h"
 
 #include <cassert>
 #include <cerrno>
@@ -231,7 +229,7 @@ void LinuxConnection::returnCredit(std::size_t bytes)
     watch();
 }
 
-void LinuxConnection::send(std::string frame)
+void LinuxConnection::send(Turn& turn, std::string frame)
 {
     const std::size_t size = frameHeadSize + frame.size();
     const std::size_t unsent = unsentBytes_.fetch_add(size) + size;
@@ -239,13 +237,8 @@ void LinuxConnection::send(std::string frame)
         breakOff("an answer is longer than a frame may be");
     else if (unsent > mostUnsentBytes)
         breakOff("it does not read its answers");
-    else if (SerialQueue::isTurnRunning())
-        return Outbox::gather(*this, frame);
-    else {
-        std::string frames;
-        appendFrame(frame, frames);
-        return write(std::move(frames));
-    }
+    else
+        return appendFrame(frame, turn.letters.to(*this));
     drop(size);
 }
 

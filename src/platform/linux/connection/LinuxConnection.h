@@ -51,10 +51,8 @@ public:
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
     void resume() override;
-    void send(std::string frame) override;
-
-    // Writes frames that were passed to `send` before, with their heads. Never blocks. Any thread.
-    void write(std::string frames);
+    void send(Turn& turn, std::string frame) override;
+    void write(std::string frames) override;
 
     // Does what the events of the socket (of epoll) ask for. False when the connection is over, which it is to be
     // forgotten for. Connection thread.

@@ -1,8 +1,7 @@
-// Only interactive queues have turns that end in something: other queues store nothing that a client waits for.
+// Only turn queues have turns that end in something: the items of others get no turn to gather anything in.
 #include "platform/linux/queues/LinuxWorkQueues.h"
 
 #include "foundation/Mutex.h"
-#include "platform/linux/queues/SerialQueue.h"
 
 #include <algorithm>
 #include <utility>
@@ -38,10 +37,14 @@ private:
 
 } // namespace
 
-std::shared_ptr<WorkQueue> LinuxWorkQueues::makeSerialQueue(std::string_view name, QualityOfService quality)
+std::shared_ptr<WorkQueue> LinuxWorkQueues::makeSerialQueue(std::string_view name, SerialQueueOptions options)
 {
-    const bool hasTurns = quality == QualityOfService::UserInteractive;
-    return std::make_shared<SerialQueue>(name, quality, hasTurns ? turnEndHandler_ : nullptr);
+    return std::make_shared<SerialQueue>(name, options);
+}
+
+std::shared_ptr<TurnQueue> LinuxWorkQueues::makeTurnQueue(std::string_view name, SerialQueueOptions options)
+{
+    return std::make_shared<SerialQueue>(name, options, turnEndHandler_);
 }
 
 void LinuxWorkQueues::submitAfter(std::chrono::nanoseconds delay, WorkQueue& queue, WorkItem item)

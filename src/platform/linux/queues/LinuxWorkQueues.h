@@ -6,25 +6,26 @@
 
 #include "platform/linux/queues/BackgroundQueue.h"
 #include "platform/linux/queues/DelayedWork.h"
-
-#include <functional>
+#include "platform/linux/queues/SerialQueue.h"
 
 namespace platform {
 
 // Any thread. Serial queues live as long as whoever made them wants, also longer than this.
 class LinuxWorkQueues final : public WorkQueues {
 public:
-    // Called on the queue's thread at the end of each turn of a serial queue whose quality is UserInteractive.
-    // Set before such a queue is made.
-    void setTurnEndHandler(std::function<void()> handler) { turnEndHandler_ = std::move(handler); }
+    // Takes what each turn of a turn queue has gathered, on the thread that ran the turn. Set before such a queue is
+    // made.
+    void setTurnEndHandler(SerialQueue::TurnEndHandler handler) { turnEndHandler_ = std::move(handler); }
 
-    [[nodiscard]] std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name, QualityOfService quality) override;
+    [[nodiscard]] std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name,
+                                                             SerialQueueOptions options) override;
+    [[nodiscard]] std::shared_ptr<TurnQueue> makeTurnQueue(std::string_view name, SerialQueueOptions options) override;
     [[nodiscard]] WorkQueue& backgroundQueue() override { return backgroundQueue_; }
     void submitAfter(std::chrono::nanoseconds delay, WorkQueue& queue, WorkItem item) override;
     [[nodiscard]] std::unique_ptr<Semaphore> makeSemaphore(unsigned initialCount) override;
 
 private:
-    std::function<void()> turnEndHandler_;
+    SerialQueue::TurnEndHandler turnEndHandler_;
     BackgroundQueue backgroundQueue_;
     DelayedWork delayedWork_; // ends first, for it feeds the other
 };

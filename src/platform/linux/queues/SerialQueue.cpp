@@ -3,6 +3,7 @@
 #include "platform/linux/queues/SerialQueue.h"
 
 #include "foundation/Mutex.h"
+#include "platform/Turn.h"
 #include "platform/linux/process/Thread.h"
 #include "platform/linux/queues/ThreadHeap.h"
 
@@ -14,15 +15,15 @@ namespace platform {
 
 class SerialQueue::Work : public std::enable_shared_from_this<Work> {
 public:
-    Work(std::function<void()> turnEndHandler, bool isInteractive)
+    Work(TurnEndHandler turnEndHandler, bool mayBeHelped)
         : turnEndHandler_(std::move(turnEndHandler)),
-          isInteractive_(isInteractive)
+          mayBeHelped_(mayBeHelped)
     {
     }
 
-    void add(WorkItem item)
+    void add(TurnItem item)
     {
-        const bool mayHelp = isInteractive_ && thisThread.mayHelp(this);
+        const bool mayHelp = mayBeHelped_ && thisThread.mayHelp(this);
         if (mayHelp && thisThread.toHelp == nullptr)
             thisThread.toHelp = shared_from_this();
         const foundation::Lock lock(lock_);
@@ -66,15 +67,10 @@ public:
     }
 
     [[nodiscard]] bool isCurrent() const noexcept { return thisThread.runs == this; }
-    [[nodiscard]] static bool isTurnRunning() noexcept
-    {
-        return thisThread.runs != nullptr && thisThread.runs->turnEndHandler_ && !thisThread.isEndingTurn;
-    }
 
     // What a thread has to do with serial queues.
     struct ThisThread {
         const Work* runs = nullptr;
-        bool isEndingTurn = false;
         bool isHelper = false;
         std::shared_ptr<Work> toHelp;
 
@@ -116,24 +112,21 @@ private:
     void takeTurn() KESTO_REQUIRES(lock_)
     {
         isTurnTaken_ = true;
-        turn_.swap(waiting_);
+        items_.swap(waiting_);
     }
 
     void runTurn()
     {
         thisThread.runs = this;
-        for (WorkItem& item : turn_) {
-            item();
+        for (TurnItem& item : items_) {
+            item(turn_);
             item = nullptr; // what it holds is released before the next one runs
         }
-        turn_.clear();
-        if (turn_.capacity() > mostRoomKept)
-            turn_ = std::vector<WorkItem>();
-        if (turnEndHandler_) {
-            thisThread.isEndingTurn = true;
-            turnEndHandler_();
-            thisThread.isEndingTurn = false;
-        }
+        items_.clear();
+        if (items_.capacity() > mostRoomKept)
+            items_ = std::vector<TurnItem>();
+        if (turnEndHandler_)
+            turnEndHandler_(turn_);
         thisThread.runs = nullptr;
         giveTurnBack();
     }
@@ -146,12 +139,13 @@ private:
             changed_.notifyOne();
     }
 
-    const std::function<void()> turnEndHandler_;
-    const bool isInteractive_;
+    const TurnEndHandler turnEndHandler_;
+    const bool mayBeHelped_;
     foundation::Mutex lock_;
     foundation::Condition changed_;
-    std::vector<WorkItem> waiting_ KESTO_GUARDED_BY(lock_);
-    std::vector<WorkItem> turn_; // of whoever has taken it
+    std::vector<TurnItem> waiting_ KESTO_GUARDED_BY(lock_);
+    std::vector<TurnItem> items_; // this and `turn_`: of the thread that has taken the turn
+    Turn turn_;
     bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // somebody runs one
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread, and nobody has woken it yet
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
@@ -159,9 +153,9 @@ private:
 
 thread_local SerialQueue::Work::ThisThread SerialQueue::Work::thisThread;
 
-SerialQueue::SerialQueue(std::string_view name, QualityOfService quality, std::function<void()> turnEndHandler)
-    : work_(std::make_shared<Work>(std::move(turnEndHandler), quality == QualityOfService::UserInteractive)),
-      thread_(startThread(name, quality, [work = work_] { work->run(); }))
+SerialQueue::SerialQueue(std::string_view name, SerialQueueOptions options, TurnEndHandler turnEndHandler)
+    : work_(std::make_shared<Work>(std::move(turnEndHandler), options.mayBeHelped)),
+      thread_(startThread(name, options.quality, [work = work_] { work->run(); }))
 {
 }
 
@@ -176,17 +170,17 @@ SerialQueue::~SerialQueue()
 
 void SerialQueue::submit(WorkItem item)
 {
+    work_->add([item = std::move(item)](Turn&) mutable { item(); });
+}
+
+void SerialQueue::submit(TurnItem item)
+{
     work_->add(std::move(item));
 }
 
 bool SerialQueue::isCurrent() const
 {
     return work_->isCurrent();
-}
-
-bool SerialQueue::isTurnRunning() noexcept
-{
-    return Work::isTurnRunning();
 }
 
 SerialQueue::Helper::Helper()

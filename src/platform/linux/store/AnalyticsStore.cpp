@@ -2,7 +2,6 @@
 #include "platform/linux/store/AnalyticsStore.h"
 
 #include "platform/linux/process/Thread.h"
-#include "platform/linux/queues/SerialQueue.h"
 
 #include <future>
 #include <utility>
@@ -46,38 +45,44 @@ AnalyticsStore::~AnalyticsStore()
 {
     {
         const foundation::Lock lock(lock_);
-        waiting_.events.takeFrom(turn_);
         isEnding_ = true;
         wakeWriter();
     }
     thread_.join();
 }
 
-void AnalyticsStore::sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder)
+void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder)
 {
     if (!isAnalyticsEventUsed(eventName)) // of those that ask before, this costs little
         return;
     const double time = clock_.secondsSince1970();
-    const foundation::Dictionary payload = payloadBuilder();
+    turn.events.add(time, eventName, payloadBuilder());
+    if (isRoomBeside(turn.events, 0))
+        return;
     const foundation::Lock lock(lock_);
-    if (SerialQueue::isTurnRunning()) {
-        turn_.add(time, eventName, payload);
-        if (isRoomBeside(turn_, 0))
-            return;
-        waiting_.events.takeFrom(turn_); // a turn that is too large is written in parts
-    } else {
-        waiting_.events.add(time, eventName, payload);
-    }
+    waiting_.events.takeFrom(turn.events); // a turn that is too large is written in parts
     wakeWriter();
     waitForRoom();
 }
 
-void AnalyticsStore::endTurn(WhenKept whenKept)
+void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder)
+{
+    if (!isAnalyticsEventUsed(eventName))
+        return;
+    const double time = clock_.secondsSince1970();
+    const foundation::Dictionary payload = payloadBuilder();
+    const foundation::Lock lock(lock_);
+    waiting_.events.add(time, eventName, payload);
+    wakeWriter();
+    waitForRoom();
+}
+
+void AnalyticsStore::endTurn(Turn& turn, WhenKept whenKept)
 {
     {
         const foundation::Lock lock(lock_);
-        if (!isEverythingKept()) {
-            waiting_.events.takeFrom(turn_);
+        if (turn.events.size() != 0 || !isEverythingKept()) {
+            waiting_.events.takeFrom(turn.events);
             if (whenKept)
                 waiting_.whenKept.push_back(std::move(whenKept));
             wakeWriter();
@@ -96,7 +101,6 @@ void AnalyticsStore::flush()
         const foundation::Lock lock(lock_);
         if (isEverythingKept())
             return;
-        waiting_.events.takeFrom(turn_);
         waiting_.whenKept.emplace_back([&kept] { kept.set_value(); });
         wakeWriter();
     }
@@ -123,7 +127,7 @@ void AnalyticsStore::applyConfiguration()
 
 bool AnalyticsStore::isEverythingKept() const
 {
-    return turn_.size() == 0 && waiting_.empty() && !isWriting_;
+    return waiting_.empty() && !isWriting_;
 }
 
 void AnalyticsStore::wakeWriter()

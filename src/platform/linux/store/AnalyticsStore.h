@@ -3,9 +3,9 @@
 //
 // The analytics service: events go to a database that anyone can query with SQL.
 //
-// Acknowledged means kept: whoever works in turns ends each with `endTurn`, and is told when everything that the
-// turn sent is committed. The turn itself never waits for the disk. A thread of the store takes what has
-// gathered as one transaction while the next turns go on, so that the busier the service, the cheaper a commit.
+// Acknowledged means kept: `endTurn` takes what a turn gathered, and calls back when all of it is committed. The turn
+// itself never waits for the disk. A thread of the store takes what has gathered as one transaction while the next
+// turns go on, so that the busier the service, the cheaper a commit.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -13,7 +13,6 @@
 #include "platform/Clock.h"
 #include "platform/linux/settings/ConfigurationWatcher.h"
 #include "platform/linux/settings/WatchedTomlFile.h"
-#include "platform/linux/store/EventBatch.h"
 #include "platform/linux/store/EventWriter.h"
 #include "platform/linux/store/UsedEventNames.h"
 
@@ -52,21 +51,21 @@ public:
         : AnalyticsStore(stateDirectory, watcher, clock, log, Limits())
     {
     }
-    // Writes everything that was sent.
+    // Writes everything that was sent, but for turns that have not ended.
     ~AnalyticsStore() override;
 
     [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override { return names_.contains(eventName); }
-    // Stamps the event with the time and builds its payload at once. An event that a turn sends is written when the
-    // turn has ended, any other at once. Blocks only while too much waits to be written.
-    void sendAnalyticsEventLazy(std::string_view eventName, PayloadBuilder payloadBuilder) override;
+    // Both stamp the event with the time and build its payload at once, and block only while too much waits to be
+    // written. An event of a turn is written when the turn has ended, or is too large, any other at once.
+    void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
+    void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
 
-    // Ends the turn that the calling thread runs. `whenKept`, unless it is empty, is called once everything sent so
-    // far is committed, or counted as lost: here and now when it is, on the store's thread otherwise, one after
-    // the other in the order of the turns. It must not use the store. Blocks only while too much waits to be
-    // written.
-    void endTurn(WhenKept whenKept);
+    // Takes the events of a turn. `whenKept`, unless it is empty, is called once everything that was taken so far is
+    // committed, or counted as lost: here and now when it is, on the store's thread otherwise, one after the other in
+    // the order of the turns. It must not use the store. Blocks only while too much waits to be written.
+    void endTurn(Turn& turn, WhenKept whenKept);
 
-    // Returns when everything sent so far is committed, or counted as lost.
+    // Returns when everything that was taken so far is committed, or counted as lost.
     void flush();
 
     // Since the start.
@@ -105,7 +104,6 @@ private:
     foundation::Mutex lock_;
     foundation::Condition changed_; // something waits to be written
     foundation::Condition room_; // what waited is being written
-    EventBatch turn_ KESTO_GUARDED_BY(lock_); // of the turn that has not ended
     Batch waiting_ KESTO_GUARDED_BY(lock_);
     std::optional<AnalyticsConfiguration> newConfiguration_ KESTO_GUARDED_BY(lock_);
     bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until those who wait have been told

@@ -6,6 +6,7 @@
 // was committed outlives the process.
 #pragma once
 
+#include "platform/EventBatch.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
 #include "platform/linux/store/StoreError.h"
@@ -22,12 +23,6 @@ struct sqlite3;
 struct sqlite3_stmt;
 
 namespace platform {
-
-struct EventRow {
-    double time = 0; // seconds since 1970 UTC
-    std::string_view name;
-    std::string_view payload; // JSON
-};
 
 // One thread at a time.
 class EventDatabase {

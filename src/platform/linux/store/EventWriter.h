@@ -3,9 +3,9 @@
 #pragma once
 
 #include "platform/Clock.h"
+#include "platform/EventBatch.h"
 #include "platform/linux/log/ProviderLog.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
-#include "platform/linux/store/EventBatch.h"
 #include "platform/linux/store/EventDatabase.h"
 #include "platform/linux/store/EventLosses.h"
 

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "foundation/cbor/Cbor.h"
+#include "platform/Connection.h"
 #include "platform/linux/connection/FrameReader.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "support/Progress.h"
@@ -41,6 +42,15 @@ inline std::string answerTo(const foundation::Array& call, std::size_t textLengt
     std::string frame;
     foundation::appendCbor(foundation::Array{call[0], std::string(textLength, 'y')}, frame);
     return frame;
+}
+
+// Sends the frame in a turn of its own.
+inline void sendAtOnce(platform::Connection& connection, std::string frame)
+{
+    platform::Turn turn;
+    connection.send(turn, std::move(frame));
+    if (auto send = turn.letters.take())
+        send();
 }
 
 class Client {

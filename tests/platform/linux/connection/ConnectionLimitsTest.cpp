@@ -1,7 +1,6 @@
 // Clients that ask for too much or read too little, and too many of them: each limit holds, costs only whoever met
 // it, and is left again.
 #include "platform/linux/connection/ConnectionHarness.h"
-#include "platform/linux/connection/Outbox.h"
 #include "support/Sanitizers.h"
 
 #include <atomic>
@@ -47,7 +46,7 @@ TEST_F(ConnectionLimits, ASlowReaderGetsAllOfALargeAnswer)
     Client client(path);
     ConnectionRecord& record = connected();
     for (int answer = 1; answer <= answers; ++answer)
-        record.connection->send(answerTo({answer}, 700 * 1024)); // more than a socket takes
+        support::sendAtOnce(*record.connection, answerTo({answer}, 700 * 1024)); // more than a socket takes
     EXPECT_EQ(client.readNumbers(answers), (std::vector<int>{1, 2, 3, 4, 5, 6}));
 }
 
@@ -62,13 +61,13 @@ TEST_F(ConnectionLimits, WhoDoesNotReadItsAnswersHoldsUpOnlyItself)
     ConnectionRecord& otherRecord = connected();
 
     for (int answer = 1; answer <= answers; ++answer)
-        record.connection->send(answerTo({answer}, answerSize));
+        support::sendAtOnce(*record.connection, answerTo({answer}, answerSize));
     EXPECT_EQ(listener->counters().readingPauses, 1U);
     client.write(callNumber(1));
 
     other.write(callNumber(1));
     ASSERT_TRUE(waitForHistory(otherRecord, {"call 1"}));
-    otherRecord.connection->send(answerTo({1}));
+    support::sendAtOnce(*otherRecord.connection, answerTo({1}));
     EXPECT_EQ(other.readNumber(), 1);
     EXPECT_EQ(callsOf(record), 0U) << "it was read from";
 
@@ -90,7 +89,7 @@ TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
     std::size_t sent = 0;
     while (sent <= LinuxConnection::mostUnsentBytes + 1024 * 1024) { // more than the socket takes on top
         const std::string answer = answerTo({1}, answerSize);
-        record.connection->send(answer);
+        support::sendAtOnce(*record.connection, answer);
         sent += frameHeadSize + answer.size();
     }
     EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
@@ -110,7 +109,7 @@ TEST_F(ConnectionLimits, AnAnswerThatNoFrameHoldsBreaksTheConnection)
     listen();
     Client client(path);
     ConnectionRecord& record = connected();
-    record.connection->send(std::string(longestFrame + 1, 'x'));
+    support::sendAtOnce(*record.connection, std::string(longestFrame + 1, 'x'));
     EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
     EXPECT_THAT(logged(), ElementsAre(endsBecause("an answer is longer than a frame may be")));
     EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + longestFrame + 1);
@@ -166,7 +165,7 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAllTheSame)
     client.write(callNumber(1));
     ASSERT_TRUE(waitForCalls(record, 1));
     client.stopReading();
-    record.connection->send(answerTo({1}));
+    support::sendAtOnce(*record.connection, answerTo({1}));
     client.write(callNumber(2));
     EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2"}));
     EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({1}).size());
@@ -181,21 +180,21 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDroppe
     constexpr std::size_t answers = LinuxConnection::manyUnsentBytes / answerSize + 1; // a turn
     std::vector<WorkItem> letters;
     LinuxWorkQueues queues;
-    queues.setTurnEndHandler([&] {
-        if (auto send = Outbox::endTurn())
+    queues.setTurnEndHandler([&](Turn& turn) {
+        if (auto send = turn.letters.take())
             progress.change([&] { letters.push_back(std::move(send)); });
     });
     listen();
     Client client(path);
     ConnectionRecord& record = connected();
     {
-        const auto queue = queues.makeSerialQueue("server", QualityOfService::UserInteractive);
-        for (std::size_t turn = 1; turn <= 2; ++turn) {
-            queue->submit([&] {
+        const auto queue = queues.makeTurnQueue("server", {.mayBeHelped = true});
+        for (std::size_t turns = 1; turns <= 2; ++turns) {
+            queue->submit([&](Turn& turn) {
                 for (std::size_t answer = 0; answer < answers; ++answer)
-                    record.connection->send(answerTo({1}, answerSize));
+                    record.connection->send(turn, answerTo({1}, answerSize));
             });
-            ASSERT_TRUE(progress.waitFor([&] { return letters.size() == turn; }));
+            ASSERT_TRUE(progress.waitFor([&] { return letters.size() == turns; }));
         }
     }
     client.stopReading();

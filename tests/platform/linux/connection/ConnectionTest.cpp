@@ -2,8 +2,6 @@
 // leave.
 #include "platform/linux/connection/ConnectionHarness.h"
 
-#include "platform/linux/connection/Outbox.h"
-
 #include <array>
 #include <atomic>
 #include <fcntl.h>
@@ -96,7 +94,7 @@ TEST_F(Connections, MayOutliveTheirListener)
     ASSERT_TRUE(waitForCalls(record, 1));
     stop();
     listener.reset();
-    record.connection->send(answerTo(record.calls[0].frame));
+    support::sendAtOnce(*record.connection, answerTo(record.calls[0].frame));
     record.calls.clear(); // which lets the caller go
     EXPECT_EQ(client.readNumber(), std::nullopt);
 }
@@ -109,7 +107,7 @@ TEST_F(Connections, DropAndCountWhatIsSentToThemWhenTheyAreOver)
     client.close();
     ASSERT_TRUE(waitForHistory(record, {"invalidated"}));
     EXPECT_EQ(listener->counters().droppedBytes, 0U);
-    record.connection->send(std::string(100, 'x'));
+    support::sendAtOnce(*record.connection, std::string(100, 'x'));
     EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + 100);
 }
 
@@ -156,7 +154,7 @@ TEST_F(Connections, ServeAThousandClientsAtOnce)
     ASSERT_EQ(::setrlimit(RLIMIT_NOFILE, &limit), 0);
 
     handler = [](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
-        record.connection->send(answerTo(call.frame));
+        support::sendAtOnce(*record.connection, answerTo(call.frame));
         return {};
     };
     listen();
@@ -233,7 +231,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionWhenThePeerResetsIt)
     client.write(callNumber(1));
     ConnectionRecord& record = connected();
     ASSERT_TRUE(waitForCalls(record, 1));
-    record.connection->send(answerTo(record.calls[0].frame));
+    support::sendAtOnce(*record.connection, answerTo(record.calls[0].frame));
     client.waitForSomethingToRead();
     client.write(callNumber(2)); // which is delivered still
     client.close();
@@ -253,13 +251,13 @@ TEST_F(ConnectionEnds, WithAnInterruptionWhenAnAnswerFindsThePeerGone)
     listen();
     Client client(path);
     ConnectionRecord& record = connected();
-    record.connection->send(answerTo({1}));
+    support::sendAtOnce(*record.connection, answerTo({1}));
     client.waitForSomethingToRead();
     Client other(path);
     other.write(callNumber(1));
     isHeldUp.wait(); // the connection thread, so that it cannot know before the answer does
     client.close();
-    record.connection->send(answerTo({2}));
+    support::sendAtOnce(*record.connection, answerTo({2}));
     EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({2}).size());
     proceed.count_down();
     EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
@@ -309,7 +307,7 @@ TEST_P(Violations, EndThatConnectionWithOneLineAndNoOther)
 
     good.write(callNumber(2));
     EXPECT_TRUE(waitForHistory(goodRecord, {"call 1", "call 2"}));
-    goodRecord.connection->send(answerTo({2}));
+    support::sendAtOnce(*goodRecord.connection, answerTo({2}));
     EXPECT_EQ(good.readNumber(), 2);
 }
 
@@ -350,11 +348,11 @@ class Turns : public support::ConnectionTest {
 protected:
     Turns()
     {
-        queues.setTurnEndHandler([this] {
-            if (auto send = Outbox::endTurn())
+        queues.setTurnEndHandler([this](Turn& turn) {
+            if (auto send = turn.letters.take())
                 progress.change([&] { ended.push_back(std::move(send)); });
         });
-        queue = queues.makeSerialQueue("server", QualityOfService::UserInteractive);
+        queue = queues.makeTurnQueue("server", {.mayBeHelped = true});
     }
     void TearDown() override
     {
@@ -363,15 +361,15 @@ protected:
     }
 
     // Runs the function as a turn of its own.
-    void turn(const std::function<void()>& function)
+    void turn(const std::function<void(Turn&)>& function)
     {
         const std::size_t before = progress.look([&] { return ended.size(); });
-        queue->submit([&] { function(); });
+        queue->submit([&](Turn& turn) { function(turn); });
         ASSERT_TRUE(progress.waitFor([&] { return ended.size() > before; }));
     }
 
     LinuxWorkQueues queues;
-    std::shared_ptr<WorkQueue> queue;
+    std::shared_ptr<TurnQueue> queue;
     std::vector<WorkItem> ended; // what sends the answers of the turns that ended
 };
 
@@ -380,9 +378,9 @@ TEST_F(Turns, HoldTheirAnswersBackUntilWhatTheyStoredIsKept)
     listen();
     Client client(path);
     ConnectionRecord& record = connected();
-    turn([&] {
-        record.connection->send(answerTo({1}));
-        record.connection->send(answerTo({2}));
+    turn([&](Turn& turn) {
+        record.connection->send(turn, answerTo({1}));
+        record.connection->send(turn, answerTo({2}));
     });
     EXPECT_FALSE(client.hasSomethingToRead());
     std::jthread([&] { ended[0](); }); // as a store's thread does
@@ -394,9 +392,9 @@ TEST_F(Turns, HoldBackNothingThatIsSentOutsideOfThem)
     listen();
     Client client(path);
     ConnectionRecord& record = connected();
-    turn([&] {
-        record.connection->send(answerTo({1}));
-        std::jthread([&] { record.connection->send(answerTo({2})); });
+    turn([&](Turn& turn) {
+        record.connection->send(turn, answerTo({1}));
+        std::jthread([&] { support::sendAtOnce(*record.connection, answerTo({2})); });
     });
     EXPECT_EQ(client.readNumber(), 2);
     EXPECT_FALSE(client.hasSomethingToRead());
@@ -415,10 +413,10 @@ TEST_F(Turns, SendToSeveralConnectionsInTheOrderOfEach)
         connections.push_back(&connected());
     }
     for (int rounds = 0; rounds < 2; ++rounds) {
-        turn([&] {
+        turn([&](Turn& turn) {
             for (int answer = 1; answer <= answers; ++answer) {
                 for (ConnectionRecord* record : connections)
-                    record->connection->send(answerTo({rounds * answers + answer}));
+                    record->connection->send(turn, answerTo({rounds * answers + answer}));
             }
         });
     }
@@ -433,7 +431,7 @@ TEST_F(Turns, SendNothingToConnectionsThatEndedMeanwhile)
     listen();
     Client client(path);
     ConnectionRecord& record = connected();
-    turn([&] { record.connection->send(answerTo({1})); });
+    turn([&](Turn& turn) { record.connection->send(turn, answerTo({1})); });
     client.close();
     ASSERT_TRUE(waitForHistory(record, {"invalidated"}));
     ended[0]();
@@ -444,10 +442,10 @@ TEST_F(Turns, AreHelpedWithByTheConnectionThread)
 {
     std::thread::id ranOn;
     handler = [&](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
-        queue->submit([&ranOn, connection = record.connection, call = std::move(call)] {
+        queue->submit([&ranOn, connection = record.connection, call = std::move(call)](Turn& turn) {
             ranOn = std::this_thread::get_id();
             EXPECT_EQ(Connection::current(), nullptr);
-            connection->send(answerTo(call.frame));
+            connection->send(turn, answerTo(call.frame));
         });
         return {};
     };
@@ -475,7 +473,7 @@ TEST_F(Turns, AnswersFromManyThreadsAllArrive)
     for (int sender = 0; sender < threads; ++sender) {
         senders.emplace_back([&, sender] {
             for (int answer = 0; answer < answers; ++answer)
-                record.connection->send(answerTo({sender * answers + answer}, 500));
+                support::sendAtOnce(*record.connection, answerTo({sender * answers + answer}, 500));
         });
     }
     std::vector<int> next(threads, 0);

@@ -1,5 +1,6 @@
 // Real threads, which are made to meet at the moments that matter by letting them wait for each other, never for a
 // while.
+#include "platform/Turn.h"
 #include "platform/linux/NoThreads.h"
 #include "platform/linux/process/Thread.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
@@ -30,7 +31,7 @@ class WorkQueuesTest : public testing::Test {
 protected:
     std::shared_ptr<WorkQueue> makeQueue(QualityOfService quality = QualityOfService::Default)
     {
-        return queues.makeSerialQueue("com.quarn.kesto.test", quality);
+        return queues.makeSerialQueue("com.quarn.kesto.test", {.quality = quality});
     }
 
     // Returns when everything submitted to the serial queue before has been run.
@@ -84,11 +85,11 @@ class TurnsTest : public WorkQueuesTest {
 protected:
     TurnsTest()
     {
-        queues.setTurnEndHandler([this] {
+        queues.setTurnEndHandler([this](Turn&) {
             history.push_back(0);
             threads.push_back(std::this_thread::get_id());
         });
-        queue = makeQueue(QualityOfService::UserInteractive);
+        queue = queues.makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
         waitUntilAsleep();
     }
     ~TurnsTest() override { queue.reset(); }
@@ -118,7 +119,7 @@ protected:
     std::vector<int> history;
     std::vector<std::thread::id> threads;
     pid_t queueThread = 0;
-    std::shared_ptr<WorkQueue> queue;
+    std::shared_ptr<TurnQueue> queue;
 };
 
 TEST_F(TurnsTest, WhatGatheredWhileATurnRanIsTheNextTurn)
@@ -153,35 +154,82 @@ TEST_F(TurnsTest, ATurnEndsWhenAllThatItsItemsHeldIsGone)
     EXPECT_EQ(history, (std::vector<int>{7, 0}));
 }
 
-TEST_F(TurnsTest, TurnIsRunningInsideItsItemsOnly)
-{
-    bool insideItem = false;
-    queue->submit([&] { insideItem = SerialQueue::isTurnRunning(); });
-    drain(*queue);
-    EXPECT_TRUE(insideItem);
-    EXPECT_FALSE(SerialQueue::isTurnRunning());
+// The events that turns gather and hand over: their numbers, turn by turn.
+class GatheringTurns : public WorkQueuesTest {
+protected:
+    GatheringTurns()
+    {
+        queues.setTurnEndHandler([this](Turn& turn) {
+            std::vector<double> numbers;
+            for (const EventRow& event : turn.events.rows())
+                numbers.push_back(event.time);
+            gathered.push_back(std::move(numbers));
+            wasCurrent = queueOfHandler == nullptr || queueOfHandler->isCurrent();
+            turn.events.clear();
+        });
+    }
+    auto adding(int number)
+    {
+        return [number](Turn& turn) { turn.events.add(number, "event", {}); };
+    }
 
-    const auto withoutTurns = makeQueue(QualityOfService::Default);
-    withoutTurns->submit([&] { insideItem = SerialQueue::isTurnRunning(); });
-    drain(*withoutTurns);
-    EXPECT_FALSE(insideItem);
+    std::vector<std::vector<double>> gathered;
+    WorkQueue* queueOfHandler = nullptr;
+    bool wasCurrent = false;
+};
+
+TEST_F(GatheringTurns, HandOverAllThatTheirItemsAddedAndBeginEmpty)
+{
+    auto queue = queues.makeTurnQueue("com.quarn.kesto.test", {});
+    const auto begun = queues.makeSemaphore(0);
+    const auto submitted = queues.makeSemaphore(0);
+    queue->submit([&](Turn& turn) {
+        begun->signal();
+        submitted->wait();
+        turn.events.add(1, "event", {});
+    });
+    begun->wait();
+    queue->submit(adding(2));
+    queue->submit([] { }); // gathers nothing
+    queue->submit(adding(3));
+    submitted->signal();
+    queue.reset();
+    EXPECT_EQ(gathered, (std::vector<std::vector<double>>{{1}, {2, 3}}));
 }
 
-TEST_F(WorkQueuesTest, TheTurnIsOverWhenItsEndHandlerIsCalled)
+TEST_F(GatheringTurns, HandOverWhatTheyGatheredOnTheirQueue)
 {
-    bool wasTurnRunning = true;
-    bool wasCurrent = false;
-    WorkQueue* queueOfHandler = nullptr;
-    queues.setTurnEndHandler([&] {
-        wasTurnRunning = SerialQueue::isTurnRunning();
-        wasCurrent = queueOfHandler->isCurrent();
-    });
-    auto queue = makeQueue(QualityOfService::UserInteractive);
+    auto queue = queues.makeTurnQueue("com.quarn.kesto.test", {});
     queueOfHandler = queue.get();
-    queue->submit([] { });
+    queue->submit(adding(1));
     queue.reset();
-    EXPECT_FALSE(wasTurnRunning);
     EXPECT_TRUE(wasCurrent);
+}
+
+TEST_F(GatheringTurns, OfTwoQueuesAreTwo)
+{
+    auto one = queues.makeTurnQueue("one", {});
+    auto other = queues.makeTurnQueue("other", {});
+    one->submit([&](Turn& turn) {
+        turn.events.add(1, "event", {});
+        other->submit(adding(2));
+        other.reset(); // returns when that turn is over
+        turn.events.add(3, "event", {});
+    });
+    one.reset();
+    EXPECT_EQ(gathered, (std::vector<std::vector<double>>{{2}, {1, 3}}));
+}
+
+TEST_F(GatheringTurns, AreTheSameWhenAHelperRunsThem)
+{
+    auto queue = queues.makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
+    {
+        const SerialQueue::Helper helper;
+        queue->submit(adding(1));
+        queue->submit(adding(2));
+    }
+    queue.reset();
+    EXPECT_EQ(gathered, (std::vector<std::vector<double>>{{1, 2}}));
 }
 
 TEST_F(TurnsTest, AHelperRunsATurnItselfWithItsEnd)
@@ -204,16 +252,10 @@ TEST_F(TurnsTest, AHelpedTurnIsTheQueues)
 {
     SerialQueue::Helper helper;
     bool isCurrent = false;
-    bool isTurnRunning = false;
-    queue->submit([&] {
-        isCurrent = queue->isCurrent();
-        isTurnRunning = SerialQueue::isTurnRunning();
-    });
+    queue->submit([&] { isCurrent = queue->isCurrent(); });
     helper.help();
     EXPECT_TRUE(isCurrent);
-    EXPECT_TRUE(isTurnRunning);
     EXPECT_FALSE(queue->isCurrent());
-    EXPECT_FALSE(SerialQueue::isTurnRunning());
 }
 
 TEST_F(TurnsTest, AHelperThatLeavesRunsWhatItHasSubmitted)
@@ -327,9 +369,9 @@ TEST_F(TurnsTest, AQueueMayBeDroppedByAnItemThatAHelperRuns)
     EXPECT_EQ(history, (std::vector<int>{1, 0}));
 }
 
-TEST_F(WorkQueuesTest, OnlyInteractiveQueuesAreHelped)
+TEST_F(WorkQueuesTest, OnlyQueuesThatMayBeHelpedAre)
 {
-    const auto queue = makeQueue(QualityOfService::Default);
+    const auto queue = makeQueue(QualityOfService::UserInteractive);
     const SerialQueue::Helper helper;
     const auto done = queues.makeSemaphore(0);
     queue->submit([&] { done->signal(); });
@@ -349,7 +391,7 @@ TEST_F(WorkQueuesTest, AQueueThatGoesRunsWhatWasSubmittedBefore)
 TEST_F(WorkQueuesTest, QueuesOutliveTheirMaker)
 {
     auto maker = std::make_unique<LinuxWorkQueues>();
-    const auto queue = maker->makeSerialQueue("left", QualityOfService::Default);
+    const auto queue = maker->makeSerialQueue("left", {});
     maker.reset();
     drain(*queue);
 }

@@ -80,7 +80,7 @@ protected:
     support::FakeLog log_;
     ConfigurationWatcher watcher_{temporary_.path() / "configuration", ProviderLog(log_)};
     LinuxWorkQueues queues_;
-    std::shared_ptr<WorkQueue> queue_ = queues_.makeSerialQueue("test", QualityOfService::Default);
+    std::shared_ptr<WorkQueue> queue_ = queues_.makeSerialQueue("test", {});
     LinuxNotifications notifications_{directory_, watcher_, ProviderLog(log_)};
 };
 

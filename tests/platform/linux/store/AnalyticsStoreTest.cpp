@@ -48,18 +48,22 @@ protected:
 
     void send(std::int64_t number, const char* name = eventName)
     {
-        store().sendAnalyticsEventLazy(name, [number] { return Dictionary{{"n", number}}; });
+        store().sendAnalyticsEventLazy(outsideTurn, name, [number] { return Dictionary{{"n", number}}; });
+    }
+    void sendIn(Turn& turn, std::int64_t number)
+    {
+        store().sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });
     }
     // Sends from within a turn, and ends it the way the service does.
-    void runTurn(std::function<void()> items, AnalyticsStore::WhenKept whenKept)
+    void runTurn(std::function<void(Turn&)> items, AnalyticsStore::WhenKept whenKept)
     {
         std::promise<void> ended;
         LinuxWorkQueues queues;
-        queues.setTurnEndHandler([&] {
-            store().endTurn(std::move(whenKept));
+        queues.setTurnEndHandler([&](Turn& turn) {
+            store().endTurn(turn, std::move(whenKept));
             ended.set_value();
         });
-        const auto queue = queues.makeSerialQueue("com.quarn.kesto.test", QualityOfService::UserInteractive);
+        const auto queue = queues.makeTurnQueue("com.quarn.kesto.test", {});
         queue->submit(std::move(items));
         ended.get_future().wait();
     }
@@ -67,7 +71,8 @@ protected:
     void sendALongLog()
     {
         for (int number = 0; number < 120; ++number)
-            store().sendAnalyticsEventLazy(eventName, [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
+            store().sendAnalyticsEventLazy(outsideTurn, eventName,
+                                           [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
         store().flush();
     }
     [[nodiscard]] std::int64_t storedEvents() { return StoreReader(file).eventCount(); }
@@ -78,8 +83,9 @@ protected:
         explicit Hold(AnalyticsStore& store)
         {
             std::promise<void> held;
-            store.sendAnalyticsEventLazy("com.quarn.hold", [] { return Dictionary(); });
-            store.endTurn([&held, released = released_.get_future()] {
+            store.sendAnalyticsEventLazy(outsideTurn, "com.quarn.hold", [] { return Dictionary(); });
+            Turn turn;
+            store.endTurn(turn, [&held, released = released_.get_future()] {
                 held.set_value();
                 released.wait();
             });
@@ -126,7 +132,7 @@ TEST_F(AnalyticsStoreTest, BuildsThePayloadOnceAndWhenTheEventIsSent)
 {
     int built = 0;
     const auto sender = std::this_thread::get_id();
-    store().sendAnalyticsEventLazy(eventName, [&] {
+    store().sendAnalyticsEventLazy(outsideTurn, eventName, [&] {
         ++built;
         EXPECT_EQ(std::this_thread::get_id(), sender);
         return Dictionary{{"key", "value"}};
@@ -167,7 +173,7 @@ TEST_F(AnalyticsStoreTest, ATurnIsKeptBeforeItIsAcknowledged)
 {
     for (std::int64_t turn = 1; turn <= 50; ++turn) {
         std::promise<std::int64_t> stored;
-        runTurn([&] { send(turn); }, [&] { stored.set_value(storedEvents()); });
+        runTurn([&](Turn& running) { sendIn(running, turn); }, [&] { stored.set_value(storedEvents()); });
         ASSERT_EQ(stored.get_future().get(), turn);
     }
 }
@@ -176,9 +182,9 @@ TEST_F(AnalyticsStoreTest, WhatATurnSentIsNotWrittenBeforeItsEnd)
 {
     store().flush();
     runTurn(
-        [&] {
-            send(1);
-            store().sendAnalyticsEventLazy(eventName, [&] { return Dictionary{{"n", 2}}; });
+        [&](Turn& turn) {
+            sendIn(turn, 1);
+            sendIn(turn, 2);
             // The store's thread is asked to write something else meanwhile.
             std::thread([&] {
                 send(3, "com.quarn.other");
@@ -195,7 +201,8 @@ TEST_F(AnalyticsStoreTest, WhatATurnSentIsNotWrittenBeforeItsEnd)
 TEST_F(AnalyticsStoreTest, ATurnThatSentNothingIsAcknowledgedHereAndNow)
 {
     std::thread::id acknowledgedOn;
-    store().endTurn([&] { acknowledgedOn = std::this_thread::get_id(); });
+    Turn turn;
+    store().endTurn(turn, [&] { acknowledgedOn = std::this_thread::get_id(); });
     EXPECT_EQ(acknowledgedOn, std::this_thread::get_id());
 }
 
@@ -203,14 +210,15 @@ TEST_F(AnalyticsStoreTest, ATurnThatSentNothingDoesNotOvertakeOneThatDid)
 {
     std::vector<int> order;
     std::promise<void> last;
+    Turn turn;
     {
         Hold hold(store());
-        send(1);
-        store().endTurn([&] { order.push_back(1); });
-        store().endTurn([&] { order.push_back(2); });
-        send(2);
-        store().endTurn([&] { order.push_back(3); });
-        store().endTurn([&] {
+        sendIn(turn, 1);
+        store().endTurn(turn, [&] { order.push_back(1); });
+        store().endTurn(turn, [&] { order.push_back(2); });
+        sendIn(turn, 2);
+        store().endTurn(turn, [&] { order.push_back(3); });
+        store().endTurn(turn, [&] {
             order.push_back(4);
             last.set_value();
         });
@@ -222,8 +230,7 @@ TEST_F(AnalyticsStoreTest, ATurnThatSentNothingDoesNotOvertakeOneThatDid)
 
 TEST_F(AnalyticsStoreTest, ATurnThatNobodyWaitsForIsKeptToo)
 {
-    runTurn([&] { send(1); }, {});
-    store().endTurn({});
+    runTurn([&](Turn& turn) { sendIn(turn, 1); }, {});
     store().flush();
     EXPECT_EQ(storedEvents(), 1);
 }
@@ -232,9 +239,10 @@ TEST_F(AnalyticsStoreTest, TurnsThatGatherDuringACommitAreOneTransaction)
 {
     // A reader sees all of them or none of them.
     Hold hold(store());
-    for (int turn = 0; turn < 10; ++turn) {
-        send(turn);
-        store().endTurn([this] { EXPECT_EQ(storedEvents(), 11); });
+    Turn turn;
+    for (int number = 0; number < 10; ++number) {
+        sendIn(turn, number);
+        store().endTurn(turn, [this] { EXPECT_EQ(storedEvents(), 11); });
     }
     EXPECT_EQ(storedEvents(), 1);
     hold.release();
@@ -249,13 +257,13 @@ TEST_F(AnalyticsStoreTest, ManyTurnsAndManyOtherThreadsLoseNothingAndKeepTheirOr
     store();
     {
         LinuxWorkQueues queues;
-        queues.setTurnEndHandler([&] {
-            store().endTurn([&, expected = store().keptEvents()] {
+        queues.setTurnEndHandler([&](Turn& turn) {
+            store().endTurn(turn, [&, expected = store().keptEvents()] {
                 EXPECT_GE(store().keptEvents(), expected);
                 ++acknowledged;
             });
         });
-        const auto queue = queues.makeSerialQueue("com.quarn.kesto.test", QualityOfService::UserInteractive);
+        const auto queue = queues.makeTurnQueue("com.quarn.kesto.test", {});
         std::vector<std::jthread> threads;
         for (int thread = 0; thread < others; ++thread)
             threads.emplace_back([this, thread] {
@@ -264,9 +272,9 @@ TEST_F(AnalyticsStoreTest, ManyTurnsAndManyOtherThreadsLoseNothingAndKeepTheirOr
                     send(number, name.c_str());
             });
         for (int turn = 0; turn < turns; ++turn)
-            queue->submit([this, turn] {
-                send(2 * turn);
-                send(2 * turn + 1);
+            queue->submit([this, turn](Turn& running) {
+                sendIn(running, 2 * turn);
+                sendIn(running, 2 * turn + 1);
             });
     }
     store().flush();
@@ -326,10 +334,10 @@ TEST_F(AnalyticsStoreTest, TooManyBytesMakeTheEndOfATurnWait)
         Hold hold(store());
         sender = std::jthread([&] {
             runTurn(
-                [&] {
-                    store().sendAnalyticsEventLazy(eventName,
+                [&](Turn& turn) {
+                    store().sendAnalyticsEventLazy(turn, eventName,
                                                    [] { return Dictionary{{"text", std::string(99'000, 'x')}}; });
-                    store().sendAnalyticsEventLazy(eventName,
+                    store().sendAnalyticsEventLazy(turn, eventName,
                                                    [] { return Dictionary{{"text", std::string(99'000, 'y')}}; });
                 },
                 {});
@@ -350,7 +358,7 @@ TEST_F(AnalyticsStoreTest, APayloadThatTwoEventsShareCountsOnce)
     const Dictionary payload{{"text", std::string(60'000, 'x')}};
     send(1);
     for (int number = 0; number < 2; ++number) // if both counted, the second would wait for ever
-        store().sendAnalyticsEventLazy(eventName, [&] { return payload; });
+        store().sendAnalyticsEventLazy(outsideTurn, eventName, [&] { return payload; });
 }
 
 TEST_F(AnalyticsStoreTest, ATurnLargerThanTheBacklogIsKeptWhole)
@@ -358,9 +366,9 @@ TEST_F(AnalyticsStoreTest, ATurnLargerThanTheBacklogIsKeptWhole)
     limits = {.mostEvents = 10, .mostBytes = 1 << 20};
     std::promise<std::int64_t> stored;
     runTurn(
-        [&] {
+        [&](Turn& turn) {
             for (int number = 0; number < 1000; ++number)
-                send(number);
+                sendIn(turn, number);
         },
         [&] { stored.set_value(storedEvents()); });
     EXPECT_EQ(stored.get_future().get(), 1000);
@@ -396,10 +404,11 @@ TEST_F(AnalyticsStoreTest, KillingTheServiceLosesNothingThatWasAcknowledged)
         if (service == 0) {
             ConfigurationWatcher childsWatcher(directory, ProviderLog(log));
             AnalyticsStore childsStore(directory, childsWatcher, clock, ProviderLog(log));
-            for (std::int64_t turn = 1;; ++turn) {
-                childsStore.sendAnalyticsEventLazy(eventName, [turn] { return Dictionary{{"n", turn}}; });
-                childsStore.endTurn([turn, &channel] {
-                    if (::write(channel[1], &turn, sizeof turn) != sizeof turn)
+            Turn turn;
+            for (std::int64_t number = 1;; ++number) {
+                childsStore.sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });
+                childsStore.endTurn(turn, [number, &channel] {
+                    if (::write(channel[1], &number, sizeof number) != sizeof number)
                         ::_exit(1);
                 });
             }

@@ -1,6 +1,6 @@
 // What a batch hands to the database: texts that stay right when batches are joined, payloads written once for both
 // events of a message, and none for what JSON cannot say.
-#include "platform/linux/store/EventBatch.h"
+#include "platform/EventBatch.h"
 
 #include <fmt/format.h>
 #include <gmock/gmock.h>

@@ -243,7 +243,7 @@ TEST_F(TraceMarkerConnections, GetTheDescriptorsWithTheirFrameHoweverMuchIsAhead
     handler = [](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
         std::string frame;
         foundation::appendCbor(Value(Array{call.frame[0], Value(), std::string(500'000, 'x')}), frame);
-        record.connection->send(std::move(frame));
+        support::sendAtOnce(*record.connection, std::move(frame));
         return {};
     };
     listen();
@@ -263,7 +263,7 @@ TEST_F(TraceMarkerConnections, OfClientsThatReadPlainlyLoseTheDescriptorsAndNoth
 {
     ASSERT_FALSE(access.open(marker.in.get()));
     handler = [](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
-        record.connection->send(support::answerTo(call.frame));
+        support::sendAtOnce(*record.connection, support::answerTo(call.frame));
         return {};
     };
     listen();

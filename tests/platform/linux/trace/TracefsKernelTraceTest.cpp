@@ -91,8 +91,7 @@ private:
     support::DeliveredEvents delivered_;
 
 public: // these go first
-    const std::shared_ptr<SerialQueue> queue =
-        std::make_shared<SerialQueue>("trace", QualityOfService::Default, nullptr);
+    const std::shared_ptr<SerialQueue> queue = std::make_shared<SerialQueue>("trace", SerialQueueOptions());
     std::unique_ptr<KernelTraceSession> session;
 };
 

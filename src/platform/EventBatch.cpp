@@ -1,5 +1,5 @@
 // All texts stand in one buffer, behind each other, so that an event needs none of its own.
-#include "platform/linux/store/EventBatch.h"
+#include "platform/EventBatch.h"
 
 #include "foundation/values/Json.h"
 

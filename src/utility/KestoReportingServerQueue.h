@@ -14,7 +14,7 @@ constexpr std::string_view gReportingQueueName = "com.quarn.kesto.reporting.serv
 void KestoReportingCreateServerQueue();
 
 // The queue. Any thread.
-[[nodiscard]] const std::shared_ptr<platform::WorkQueue>& KestoReportingServerQueue();
+[[nodiscard]] const std::shared_ptr<platform::TurnQueue>& KestoReportingServerQueue();
 
 // In debug builds, stops whoever calls what belongs on the server queue from elsewhere.
 inline void KestoReportingAssertServerQueue()

@@ -1,12 +1,11 @@
-// Events on their way to the database, written out as they will stand there.
+// Events on their way to what keeps them, written out as they will stand there.
 //
-// A payload becomes JSON when its event is added, on the thread that built it: taken apart on the store's thread, every
+// A payload becomes JSON when its event is added, on the thread that built it: taken apart on another thread, every
 // string that it shares with other messages would wander between two processors. Only a large payload waits for the
-// store's thread, because clients wait for the one that adds it.
+// thread that keeps the events, because clients wait for the one that adds it.
 #pragma once
 
 #include "foundation/values/Value.h"
-#include "platform/linux/store/EventDatabase.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -16,6 +15,13 @@
 #include <vector>
 
 namespace platform {
+
+// One event as it is kept.
+struct EventRow {
+    double time = 0; // seconds since 1970 UTC
+    std::string_view name;
+    std::string_view payload; // JSON
+};
 
 // One thread at a time.
 class EventBatch {
