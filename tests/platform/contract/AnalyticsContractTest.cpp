@@ -3,6 +3,8 @@
 #include "platform/contract/Contract.h"
 #include "platform/linux/process/LinuxClock.h"
 #include "platform/linux/store/AnalyticsStore.h"
+#include "platform/linux/store/EventWriter.h"
+#include "platform/linux/store/MemoryKeeper.h"
 #include "platform/linux/store/StoreReader.h"
 #include "support/ParseJson.h"
 #include "support/TemporaryDirectory.h"
@@ -47,14 +49,15 @@ private:
     support::FakeAnalytics analytics_;
 };
 
-class LinuxAnalyticsSubject final : public AnalyticsSubject {
+// The store of Linux, on one keeper of events or another.
+class StoreSubject : public AnalyticsSubject {
 public:
-    LinuxAnalyticsSubject() { configure(); }
+    StoreSubject() { configure(); }
 
     [[nodiscard]] platform::Analytics& analytics() override
     {
         if (!store_)
-            store_.emplace(directory_.path(), watcher_, clock_, platform::ProviderLog(log_));
+            store_.emplace(makeKeeper(), watcher_, clock_, platform::ProviderLog(log_));
         return *store_;
     }
     void use(const std::string& pattern) override
@@ -66,24 +69,62 @@ public:
     [[nodiscard]] std::vector<AnalyticsEvent> events() override
     {
         store_.reset(); // which keeps all of them
+        return kept();
+    }
+
+protected:
+    [[nodiscard]] virtual std::unique_ptr<platform::EventKeeper> makeKeeper() = 0;
+    [[nodiscard]] virtual std::vector<AnalyticsEvent> kept() = 0;
+    [[nodiscard]] static AnalyticsEvent event(const std::string& name, const std::string& payload)
+    {
+        return {name, support::parseJson(payload).value().dictionary().value()};
+    }
+
+    const support::TemporaryDirectory directory_;
+    support::FakeLog log_;
+    platform::LinuxClock clock_;
+
+private:
+    void configure() { support::replaceFile(directory_ / "analytics.toml", "used = [" + patterns_ + "]\n"); }
+
+    std::string patterns_;
+    platform::ConfigurationWatcher watcher_{directory_.path(), platform::ProviderLog(log_)};
+    std::optional<platform::AnalyticsStore> store_;
+};
+
+class LinuxAnalyticsSubject final : public StoreSubject {
+private:
+    [[nodiscard]] std::unique_ptr<platform::EventKeeper> makeKeeper() override
+    {
+        return std::make_unique<platform::EventWriter>(directory_.path(), clock_, platform::ProviderLog(log_));
+    }
+    [[nodiscard]] std::vector<AnalyticsEvent> kept() override
+    {
         support::StoreReader reader(directory_ / platform::EventWriter::fileName);
         const auto names = reader.texts("SELECT name FROM events ORDER BY rowid");
         const auto payloads = reader.texts("SELECT payload FROM events ORDER BY rowid");
         std::vector<AnalyticsEvent> events;
         for (std::size_t index = 0; index < names.size(); ++index)
-            events.push_back({names[index], support::parseJson(payloads.at(index)).value().dictionary().value()});
+            events.push_back(event(names[index], payloads.at(index)));
+        return events;
+    }
+};
+
+class MemoryAnalyticsSubject final : public StoreSubject {
+private:
+    [[nodiscard]] std::unique_ptr<platform::EventKeeper> makeKeeper() override
+    {
+        return std::make_unique<support::MemoryKeeper>(place_, clock_);
+    }
+    [[nodiscard]] std::vector<AnalyticsEvent> kept() override
+    {
+        std::vector<AnalyticsEvent> events;
+        for (const support::KeptEvent& each : place_->all())
+            events.push_back(event(each.name, each.payload));
         return events;
     }
 
-private:
-    void configure() { support::replaceFile(directory_ / "analytics.toml", "used = [" + patterns_ + "]\n"); }
-
-    const support::TemporaryDirectory directory_;
-    support::FakeLog log_;
-    std::string patterns_;
-    platform::LinuxClock clock_;
-    platform::ConfigurationWatcher watcher_{directory_.path(), platform::ProviderLog(log_)};
-    std::optional<platform::AnalyticsStore> store_;
+    const std::shared_ptr<support::KeptEvents> place_ = std::make_shared<support::KeptEvents>();
 };
 
 class AnalyticsContract : public Suite<AnalyticsSubject> {
@@ -101,7 +142,8 @@ protected:
     }
 };
 KESTO_CONTRACT(AnalyticsContract, (provider<AnalyticsSubject, FakeAnalyticsSubject>("Fake")),
-               (provider<AnalyticsSubject, LinuxAnalyticsSubject>("Linux")));
+               (provider<AnalyticsSubject, LinuxAnalyticsSubject>("Linux")),
+               (provider<AnalyticsSubject, MemoryAnalyticsSubject>("LinuxInMemory")));
 
 TEST_P(AnalyticsContract, WantsEventsOfTheNamesThatSomebodyUses)
 {

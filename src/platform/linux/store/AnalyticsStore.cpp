@@ -29,12 +29,12 @@ bool AnalyticsStore::isRoomBeside(const EventBatch& events, std::size_t waiters)
 
 // --- What others call
 
-AnalyticsStore::AnalyticsStore(const std::filesystem::path& stateDirectory, ConfigurationWatcher& watcher,
-                               const Clock& clock, ProviderLog log, Limits limits)
+AnalyticsStore::AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
+                               ProviderLog log, Limits limits)
     : clock_(clock),
       log_(log),
       limits_(limits),
-      writer_(stateDirectory, clock, log),
+      keeper_(std::move(keeper)),
       configurationFile_(watcher, "analytics.toml", log, [this] { applyConfiguration(); })
 {
     applyConfiguration();
@@ -46,7 +46,7 @@ AnalyticsStore::~AnalyticsStore()
     {
         const foundation::Lock lock(lock_);
         isEnding_ = true;
-        wakeWriter();
+        wakeKeeper();
     }
     thread_.join();
 }
@@ -61,7 +61,7 @@ void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, std::string_view eventNa
         return;
     const foundation::Lock lock(lock_);
     waiting_.events.takeFrom(turn.events); // a turn that is too large is written in parts
-    wakeWriter();
+    wakeKeeper();
     waitForRoom();
 }
 
@@ -73,7 +73,7 @@ void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, std::string_view eventN
     const foundation::Dictionary payload = payloadBuilder();
     const foundation::Lock lock(lock_);
     waiting_.events.add(time, eventName, payload);
-    wakeWriter();
+    wakeKeeper();
     waitForRoom();
 }
 
@@ -85,7 +85,7 @@ void AnalyticsStore::endTurn(Turn& turn, WhenKept whenKept)
             waiting_.events.takeFrom(turn.events);
             if (whenKept)
                 waiting_.whenKept.push_back(std::move(whenKept));
-            wakeWriter();
+            wakeKeeper();
             waitForRoom();
             return;
         }
@@ -102,7 +102,7 @@ void AnalyticsStore::flush()
         if (isEverythingKept())
             return;
         waiting_.whenKept.emplace_back([&kept] { kept.set_value(); });
-        wakeWriter();
+        wakeKeeper();
     }
     kept.get_future().wait();
 }
@@ -119,7 +119,7 @@ void AnalyticsStore::applyConfiguration()
         names_.setPatterns(checked.configuration.used);
         newConfiguration_ = std::move(checked.configuration);
         problems = std::move(checked.problems);
-        wakeWriter();
+        wakeKeeper();
     }
     for (const std::string& problem : problems)
         log_.error("{}: {}; the default counts until this is corrected", configurationFile_.path().native(), problem);
@@ -130,7 +130,7 @@ bool AnalyticsStore::isEverythingKept() const
     return waiting_.empty() && !isWriting_;
 }
 
-void AnalyticsStore::wakeWriter()
+void AnalyticsStore::wakeKeeper()
 {
     if (std::exchange(isAsleep_, false))
         changed_.notifyOne();
@@ -149,14 +149,14 @@ void AnalyticsStore::run()
     Batch batch;
     for (bool isFirst = true; take(batch); isFirst = false) {
         if (isFirst)
-            writer_.open();
+            keeper_->open();
         const bool isQuiet = batch.empty();
-        writer_.keep(batch.events);
+        keeper_->keep(batch.events);
         for (WhenKept& whenKept : batch.whenKept)
             whenKept();
         finish();
         batch.clear();
-        while (writer_.maintain(isQuiet) && isIdle()) { }
+        while (keeper_->tidy(isQuiet) && isIdle()) { }
     }
 }
 
@@ -178,7 +178,7 @@ bool AnalyticsStore::take(Batch& batch)
         room_.notifyAll();
     }
     if (configuration)
-        writer_.setConfiguration(*configuration);
+        keeper_->setConfiguration(*configuration);
     return true;
 }
 
@@ -187,7 +187,7 @@ bool AnalyticsStore::sleep()
 {
     bool isQuiet = false;
     isAsleep_ = true;
-    if (!writer_.awaitsQuiet())
+    if (!keeper_->awaitsQuiet())
         changed_.wait(lock_);
     else
         isQuiet = changed_.waitUntil(lock_, std::chrono::steady_clock::now() + quietTime) == std::cv_status::timeout;

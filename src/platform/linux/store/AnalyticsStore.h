@@ -1,7 +1,8 @@
 // The room of the store: from an event that was sent to a row on the disk. It alone touches SQLite and the state
 // directory's database.
 //
-// The analytics service: events go to a database that anyone can query with SQL.
+// The analytics service: events go to an EventKeeper, which for the service is a database that anyone can query with
+// SQL.
 //
 // Acknowledged means kept: `endTurn` takes what a turn gathered, and calls back when all of it is committed. The turn
 // itself never waits for the disk. A thread of the store takes what has gathered as one transaction while the next
@@ -13,16 +14,17 @@
 #include "platform/Clock.h"
 #include "platform/linux/settings/ConfigurationWatcher.h"
 #include "platform/linux/settings/WatchedTomlFile.h"
-#include "platform/linux/store/EventWriter.h"
+#include "platform/linux/store/EventKeeper.h"
 #include "platform/linux/store/UsedEventNames.h"
 
 #include <chrono>
 #include <cstddef>
-#include <filesystem>
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string_view>
 #include <thread>
+#include <utility>
 #include <vector>
 
 namespace platform {
@@ -42,13 +44,13 @@ public:
     // After how long without an event it is quiet.
     static constexpr std::chrono::milliseconds quietTime{50};
 
-    // Events go to `EventWriter::fileName` in the state directory; analytics.toml in the configuration directory
-    // says which are wanted and for how long they are kept.
-    AnalyticsStore(const std::filesystem::path& stateDirectory, ConfigurationWatcher& watcher, const Clock& clock,
+    // Events go to the keeper; analytics.toml in the configuration directory says which are wanted and for how long
+    // they are kept.
+    AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
                    ProviderLog log, Limits limits);
-    AnalyticsStore(const std::filesystem::path& stateDirectory, ConfigurationWatcher& watcher, const Clock& clock,
+    AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
                    ProviderLog log)
-        : AnalyticsStore(stateDirectory, watcher, clock, log, Limits())
+        : AnalyticsStore(std::move(keeper), watcher, clock, log, Limits())
     {
     }
     // Writes everything that was sent, but for turns that have not ended.
@@ -69,8 +71,8 @@ public:
     void flush();
 
     // Since the start.
-    [[nodiscard]] std::uint64_t keptEvents() const noexcept { return writer_.keptEvents(); }
-    [[nodiscard]] std::uint64_t lostEvents(StoreError reason) const noexcept { return writer_.losses().count(reason); }
+    [[nodiscard]] std::uint64_t keptEvents() const noexcept { return keeper_->keptEvents(); }
+    [[nodiscard]] std::uint64_t lostEvents(StoreError reason) const noexcept { return keeper_->lostEvents(reason); }
 
 private:
     // Events, and who waits for them.
@@ -85,7 +87,7 @@ private:
     void applyConfiguration();
     [[nodiscard]] bool isRoomBeside(const EventBatch& events, std::size_t waiters) const noexcept;
     [[nodiscard]] bool isEverythingKept() const KESTO_REQUIRES(lock_);
-    void wakeWriter() KESTO_REQUIRES(lock_);
+    void wakeKeeper() KESTO_REQUIRES(lock_);
     void waitForRoom() KESTO_REQUIRES(lock_);
 
     // The store's thread.
@@ -99,7 +101,7 @@ private:
     const ProviderLog log_;
     const Limits limits_;
     UsedEventNames names_;
-    EventWriter writer_; // the store's thread's
+    const std::unique_ptr<EventKeeper> keeper_; // the store's thread's
 
     foundation::Mutex lock_;
     foundation::Condition changed_; // something waits to be written

@@ -199,7 +199,7 @@ bool EventWriter::awaitsQuiet() const
     return database_ && isLogLongerBy(logBytesBetweenCheckpoints);
 }
 
-bool EventWriter::maintain(bool isQuiet)
+bool EventWriter::tidy(bool isQuiet)
 {
     losses_.report();
     if (!database_)
@@ -210,7 +210,7 @@ bool EventWriter::maintain(bool isQuiet)
         emptyLog();
     const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
         || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
-    hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && tidy(); // tidying makes the log longer
+    hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && makeRoom(); // which makes the log longer
     return hasMoreToTidy_;
 }
 
@@ -233,7 +233,7 @@ bool EventWriter::emptyLog()
 
 // Makes more room than was taken since the last time, so that it keeps up, but not all of it at once. True when more
 // is left to do.
-bool EventWriter::tidy()
+bool EventWriter::makeRoom()
 {
     const std::uint64_t mostFreed = 2 * std::exchange(bytesSinceCheck_, 0) + bytesTidiedAtOnce;
     checkedAt_ = clock_.systemUptime();
@@ -242,7 +242,7 @@ bool EventWriter::tidy()
     auto size = database_->size();
     const std::uint64_t roomBefore = size ? room(*size) : 0;
     while (size && room(*size) + mostFreed > roomBefore) {
-        const auto hasMore = tidySome(*size);
+        const auto hasMore = makeSomeRoom(*size);
         if (hasMore && !*hasMore)
             return false;
         size = hasMore ? database_->size() : std::unexpected(hasMore.error());
@@ -253,7 +253,7 @@ bool EventWriter::tidy()
 }
 
 // False when nothing is left to do.
-EventWriter::Expected<bool> EventWriter::tidySome(const EventDatabase::Size& size)
+EventWriter::Expected<bool> EventWriter::makeSomeRoom(const EventDatabase::Size& size)
 {
     const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
     const auto deleted = size.usedBytes > maximumBytes()

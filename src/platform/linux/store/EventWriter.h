@@ -1,12 +1,11 @@
-// Keeps events in the database, come what may: a damaged database is set aside and a new one begun, what cannot be
-// kept is counted and told, and what is too old or too much goes.
+// Keeps events in an SQLite database, come what may: a damaged database is set aside and a new one begun, what cannot
+// be kept is counted and told, and what is too old or too much goes.
 #pragma once
 
 #include "platform/Clock.h"
-#include "platform/EventBatch.h"
 #include "platform/linux/log/ProviderLog.h"
-#include "platform/linux/store/AnalyticsConfiguration.h"
 #include "platform/linux/store/EventDatabase.h"
+#include "platform/linux/store/EventKeeper.h"
 #include "platform/linux/store/EventLosses.h"
 
 #include <atomic>
@@ -19,7 +18,7 @@
 namespace platform {
 
 // One thread, but for the counts.
-class EventWriter {
+class EventWriter final : public EventKeeper {
 public:
     static constexpr std::string_view fileName = "analytics.sqlite3";
     static constexpr std::size_t mostDamagedKept = 3; // databases set aside; older ones are removed
@@ -41,21 +40,15 @@ public:
 
     EventWriter(const std::filesystem::path& directory, const Clock& clock, ProviderLog log);
 
-    void setConfiguration(const AnalyticsConfiguration& configuration);
+    void setConfiguration(const AnalyticsConfiguration& configuration) override;
 
-    // Opens the database, so that it is there before the first event.
-    void open();
-    // Keeps the events in one transaction; they are committed, or counted as lost, when this returns.
-    void keep(EventBatch& events);
-    // Whether some housekeeping waits for a quiet moment.
-    [[nodiscard]] bool awaitsQuiet() const;
-    // Does some of the housekeeping that is due; true when more is left to do. `isQuiet`: nothing is to be
-    // kept now.
-    bool maintain(bool isQuiet);
+    void open() override;
+    void keep(EventBatch& events) override; // in one transaction
+    [[nodiscard]] bool awaitsQuiet() const override;
+    bool tidy(bool isQuiet) override;
 
-    // Any thread.
-    [[nodiscard]] std::uint64_t keptEvents() const noexcept { return kept_; }
-    [[nodiscard]] const EventLosses& losses() const noexcept { return losses_; }
+    [[nodiscard]] std::uint64_t keptEvents() const noexcept override { return kept_; }
+    [[nodiscard]] std::uint64_t lostEvents(StoreError reason) const noexcept override { return losses_.count(reason); }
 
 private:
     template <typename Result = void> using Expected = EventDatabase::Expected<Result>;
@@ -68,8 +61,8 @@ private:
     void handleFailure(StoreError error);
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     bool emptyLog();
-    [[nodiscard]] bool tidy();
-    [[nodiscard]] Expected<bool> tidySome(const EventDatabase::Size& size);
+    [[nodiscard]] bool makeRoom();
+    [[nodiscard]] Expected<bool> makeSomeRoom(const EventDatabase::Size& size);
     [[nodiscard]] std::uint64_t maximumBytes() const noexcept;
 
     const std::filesystem::path path_;

@@ -3,6 +3,7 @@
 #include "platform/linux/store/AnalyticsStore.h"
 
 #include "platform/linux/queues/LinuxWorkQueues.h"
+#include "platform/linux/store/EventWriter.h"
 #include "platform/linux/store/ManualClock.h"
 #include "platform/linux/store/StoreReader.h"
 #include "support/Sanitizers.h"
@@ -41,7 +42,9 @@ protected:
     AnalyticsStore& store()
     {
         if (!store_)
-            store_ = std::make_unique<AnalyticsStore>(temporary.path(), watcher, clock, ProviderLog(log), limits);
+            store_ = std::make_unique<AnalyticsStore>(
+                std::make_unique<EventWriter>(temporary.path(), clock, ProviderLog(log)), watcher, clock,
+                ProviderLog(log), limits);
         return *store_;
     }
     void closeStore() { store_.reset(); }
@@ -403,7 +406,8 @@ TEST_F(AnalyticsStoreTest, KillingTheServiceLosesNothingThatWasAcknowledged)
         const pid_t service = ::fork();
         if (service == 0) {
             ConfigurationWatcher childsWatcher(directory, ProviderLog(log));
-            AnalyticsStore childsStore(directory, childsWatcher, clock, ProviderLog(log));
+            AnalyticsStore childsStore(std::make_unique<EventWriter>(directory, clock, ProviderLog(log)), childsWatcher,
+                                       clock, ProviderLog(log));
             Turn turn;
             for (std::int64_t number = 1;; ++number) {
                 childsStore.sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });

@@ -94,7 +94,7 @@ protected:
     void keep(const std::vector<AnalyticsEvent>& given) { keepIn(writer(), given); }
     void maintain(bool isQuiet = true)
     {
-        while (writer().maintain(isQuiet)) { }
+        while (writer().tidy(isQuiet)) { }
     }
     std::uint64_t logBytes() const { return fs::file_size(directory / "analytics.sqlite3-wal"); }
     [[nodiscard]] std::vector<std::string> filesNamed(std::string_view part) const
@@ -106,7 +106,7 @@ protected:
         std::ranges::sort(names);
         return names;
     }
-    std::uint64_t lost(StoreError reason) { return writer().losses().count(reason); }
+    std::uint64_t lost(StoreError reason) { return writer().lostEvents(reason); }
 
     support::TemporaryDirectory temporary;
     fs::path directory = temporary.path();
@@ -387,7 +387,7 @@ TEST_F(EventWriterTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
                                                   "give each service its own state directory")))));
     const std::vector<AnalyticsEvent> given{event(2, "second")};
     keepIn(second, given);
-    EXPECT_EQ(second.losses().count(StoreError::InUse), 1U);
+    EXPECT_EQ(second.lostEvents(StoreError::InUse), 1U);
     closeWriter();
     clock.advance(EventWriter::secondsBetweenOpenings);
     keepIn(second, given);
@@ -816,7 +816,7 @@ TEST_F(EventWriterTest, HousekeepingIsDoneInSmallSteps)
     configuration.maximumSizeMegabytes = 1;
     writer().setConfiguration(configuration);
     int steps = 1;
-    while (writer().maintain(true))
+    while (writer().tidy(true))
         ++steps;
     EXPECT_GT(steps, 15);
 }

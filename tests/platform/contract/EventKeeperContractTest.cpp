@@ -1,0 +1,177 @@
+// The contract of platform/linux/store/EventKeeper.h: what is kept lasts in its order, and what is too old or too much
+// goes.
+#include "platform/contract/Contract.h"
+#include "platform/linux/store/EventWriter.h"
+#include "platform/linux/store/ManualClock.h"
+#include "platform/linux/store/MemoryKeeper.h"
+#include "platform/linux/store/StoreReader.h"
+#include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+
+#include <gmock/gmock.h>
+#include <limits>
+
+namespace contract {
+namespace {
+
+using foundation::Dictionary;
+using platform::StoreError;
+using testing::ElementsAre;
+using testing::IsEmpty;
+
+constexpr double secondsADay = 86400;
+
+class EventKeeperSubject {
+public:
+    virtual ~EventKeeperSubject() = default;
+    // Made anew after `close`, in the same place.
+    [[nodiscard]] virtual platform::EventKeeper& keeper() = 0;
+    virtual void close() = 0;
+    // The payloads of the events that lie there now, in their order.
+    [[nodiscard]] virtual std::vector<std::string> payloads() = 0;
+
+    support::ManualClock clock;
+};
+
+class MemoryKeeperSubject final : public EventKeeperSubject {
+public:
+    [[nodiscard]] platform::EventKeeper& keeper() override
+    {
+        if (!keeper_)
+            keeper_.emplace(place_, clock);
+        return *keeper_;
+    }
+    void close() override { keeper_.reset(); }
+    [[nodiscard]] std::vector<std::string> payloads() override
+    {
+        std::vector<std::string> payloads;
+        for (const support::KeptEvent& event : place_->all())
+            payloads.push_back(event.payload);
+        return payloads;
+    }
+
+private:
+    const std::shared_ptr<support::KeptEvents> place_ = std::make_shared<support::KeptEvents>();
+    std::optional<support::MemoryKeeper> keeper_;
+};
+
+class SqliteKeeperSubject final : public EventKeeperSubject {
+public:
+    [[nodiscard]] platform::EventKeeper& keeper() override
+    {
+        if (!keeper_)
+            keeper_.emplace(directory_.path(), clock, platform::ProviderLog(log_));
+        return *keeper_;
+    }
+    void close() override { keeper_.reset(); }
+    [[nodiscard]] std::vector<std::string> payloads() override
+    {
+        return support::StoreReader(directory_ / platform::EventWriter::fileName)
+            .texts("SELECT payload FROM events ORDER BY id");
+    }
+
+private:
+    const support::TemporaryDirectory directory_;
+    support::FakeLog log_;
+    std::optional<platform::EventWriter> keeper_;
+};
+
+class EventKeeperContract : public Suite<EventKeeperSubject> {
+protected:
+    void SetUp() override { begin(); }
+    void begin()
+    {
+        subject->keeper().setConfiguration(configuration);
+        subject->keeper().open();
+    }
+    void add(Dictionary payload) { batch.add(subject->clock.secondsSince1970(), "com.quarn.a", payload); }
+    void keep()
+    {
+        subject->keeper().keep(batch);
+        batch.clear();
+    }
+    void tidy()
+    {
+        while (subject->keeper().tidy(true)) { }
+    }
+
+    platform::AnalyticsConfiguration configuration;
+    platform::EventBatch batch;
+};
+KESTO_CONTRACT(EventKeeperContract, (provider<EventKeeperSubject, MemoryKeeperSubject>("Memory")),
+               (provider<EventKeeperSubject, SqliteKeeperSubject>("Sqlite")));
+
+TEST_P(EventKeeperContract, IsThereAndEmptyOnceItIsOpen)
+{
+    EXPECT_THAT(subject->payloads(), IsEmpty());
+    EXPECT_EQ(subject->keeper().keptEvents(), 0U);
+}
+
+TEST_P(EventKeeperContract, KeepsBatchesInTheirOrderWhenItReturns)
+{
+    add({{"n", 1}});
+    add({{"n", 2}});
+    keep();
+    EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":1}", "{\"n\":2}"));
+    add({{"n", 3}});
+    keep();
+    EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":1}", "{\"n\":2}", "{\"n\":3}"));
+    EXPECT_EQ(subject->keeper().keptEvents(), 3U);
+}
+
+TEST_P(EventKeeperContract, KeepsWhatItKeptWhenItIsClosedAndOpenedAgain)
+{
+    add({{"n", 1}});
+    keep();
+    subject->close();
+    begin();
+    add({{"n", 2}});
+    keep();
+    EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":1}", "{\"n\":2}"));
+}
+
+TEST_P(EventKeeperContract, LosesOnlyAnEventThatJsonCannotSayAndCountsIt)
+{
+    add({{"n", 1}});
+    add({{"n", std::numeric_limits<double>::infinity()}});
+    add({{"n", 2}});
+    keep();
+    EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":1}", "{\"n\":2}"));
+    EXPECT_EQ(subject->keeper().keptEvents(), 2U);
+    EXPECT_EQ(subject->keeper().lostEvents(StoreError::NotJson), 1U);
+    EXPECT_EQ(subject->keeper().lostEvents(StoreError::DiskFull), 0U);
+}
+
+TEST_P(EventKeeperContract, RemovesWhatIsTooOld)
+{
+    configuration.maximumAgeDays = 10;
+    subject->keeper().setConfiguration(configuration);
+    add({{"n", 1}});
+    keep();
+    subject->clock.advance(9 * secondsADay);
+    add({{"n", 2}});
+    keep();
+    tidy();
+    EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":1}", "{\"n\":2}"));
+    subject->clock.advance(2 * secondsADay);
+    tidy();
+    EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":2}"));
+}
+
+TEST_P(EventKeeperContract, RemovesTheOldestOfWhatIsTooMuch)
+{
+    configuration.maximumSizeMegabytes = 1;
+    subject->keeper().setConfiguration(configuration);
+    for (int number = 0; number < 40; ++number)
+        add({{"text", std::string(50'000, static_cast<char>('a' + number % 26))}, {"n", number}});
+    keep();
+    tidy();
+    const auto left = subject->payloads();
+    EXPECT_LE(left.size(), 20U);
+    ASSERT_GE(left.size(), 10U);
+    EXPECT_THAT(left.back(), testing::HasSubstr("\"n\":39"));
+    EXPECT_THAT(left.front(), testing::HasSubstr("\"n\":" + std::to_string(40 - left.size()))) << "the newest stay";
+}
+
+} // namespace
+} // namespace contract
