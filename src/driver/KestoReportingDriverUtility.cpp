@@ -2,6 +2,7 @@
 #include "driver/KestoReportingDriverUtility.h"
 
 #include "platform/Platform.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
 
 namespace {
@@ -56,6 +57,7 @@ void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver)
 
 KestoReportingDriverSnapShot KestoReportingDriverUtility::getSnapShot() const
 {
+    KestoReportingAssertServerQueue();
     KestoReportingDriverSnapShot snapShot;
     for (const auto& [driver, subscription, channels] : ioChannelSubscriptions_) {
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "sampling driver {}", driver.description());

@@ -4,6 +4,7 @@
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <algorithm>
@@ -85,6 +86,7 @@ void appendComponent(const std::optional<std::string>& component, std::string& k
 void KestoReportingDriverUtility::sendDriverLogsForSession(platform::Turn& turn,
                                                            const std::shared_ptr<KestoReportingSession>& session) const
 {
+    KestoReportingAssertServerQueue();
     DriverStatsByFormat stats;
     for (const auto& [driver, subscription, channels] : ioChannelSubscriptions_) {
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "getting latest samples");

@@ -32,12 +32,32 @@ private:
 // Holds a mutex as long as it lives.
 class KESTO_THREAD_ANNOTATION(scoped_lockable) Lock {
 public:
-    explicit Lock(Mutex& mutex) KESTO_THREAD_ANNOTATION(acquire_capability(mutex)) : mutex_(mutex) { mutex_.lock(); }
-    ~Lock() KESTO_THREAD_ANNOTATION(release_capability()) { mutex_.unlock(); }
+    explicit Lock(Mutex& mutex) KESTO_THREAD_ANNOTATION(acquire_capability(mutex)) : mutex_(mutex)
+    {
+        mutex_.lock();
+        count(1);
+    }
+    ~Lock() KESTO_THREAD_ANNOTATION(release_capability())
+    {
+        mutex_.unlock();
+        count(-1);
+    }
     Lock(const Lock&) = delete;
     Lock& operator=(const Lock&) = delete;
 
+#ifndef NDEBUG
+    // Whether the calling thread holds any. For assertions, so that only debug builds count.
+    [[nodiscard]] static bool isAnyHeld() noexcept { return heldByThisThread != 0; }
+#endif
+
 private:
+#ifndef NDEBUG
+    static void count(int change) noexcept { heldByThisThread += change; }
+    static inline thread_local int heldByThisThread = 0;
+#else
+    static void count(int) noexcept { }
+#endif
+
     Mutex& mutex_;
 };
 

@@ -7,9 +7,9 @@
 // before it did, on whichever thread each of them ran. So what only the items of one serial queue touch needs no lock.
 //
 // Threads: items belong to their queue, not to a thread. A queue that may be helped has its items run by its own thread
-// or by one that submitted some, which takes them on when it has nothing else to do, and which then runs what others
-// submitted as well. So nothing that an item needs may be thread-local, and a thread holds no lock while it submits to
-// such a queue: the item that takes the same lock might run on that very thread. Debug builds stop who holds one.
+// or by a thread that submitted some and offers its help, which then also runs what others submitted. So nothing that
+// an item needs may be thread-local, and a thread that helps holds no lock while it submits to such a queue, nor when
+// it would sleep: an item that takes the same lock might run on that very thread. Debug builds end where it holds one.
 //
 // No queue polls; one that is empty has a sleeping thread, or none.
 #pragma once

@@ -7,6 +7,7 @@
 #include "sinks/KestoReportingFennicBridge.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -111,6 +112,7 @@ void KestoReportingSession::updateConfigurationWithContentsOfConfiguration(
 
 void KestoReportingSession::setDriverSnapShot(std::optional<KestoReportingDriverSnapShot> snapShot)
 {
+    KestoReportingAssertServerQueue();
     if (!driverSnapShotShare_.resize(snapShot ? roughBytes(*snapShot) : 0)) {
         KESTO_LOG(KestoReportingSessionCategory(), Error,
                   "no memory left for the drivers' snapshot of session {}; its driver statistics are lost",
@@ -123,6 +125,7 @@ void KestoReportingSession::setDriverSnapShot(std::optional<KestoReportingDriver
 
 void KestoReportingSession::start()
 {
+    KestoReportingAssertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "starting session owned by {}", reporterID_);
     if (started_) {
         KESTO_LOG(KestoReportingSessionCategory(), Info, "{} is already started", reporterID_);
@@ -140,6 +143,7 @@ void KestoReportingSession::start()
 
 void KestoReportingSession::stop(platform::Turn& turn)
 {
+    KestoReportingAssertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     if (!started_)
         return;

@@ -2,6 +2,7 @@
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -12,6 +13,7 @@ void KestoReportingSession::sendMessage(const std::optional<foundation::Dictiona
                                         AudioEventCategory category, AudioEventType type, [[maybe_unused]] bool sync,
                                         const MessageReply& reply)
 {
+    KestoReportingAssertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending message for session owned by {}", reporterID_);
     createMessageIdentifier(
         category, type,

@@ -3,6 +3,7 @@
 
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <array>
@@ -73,6 +74,7 @@ void KestoReportingFennicBridge::handleEvent(platform::Turn& turn, const foundat
                                              AudioEventCategory category, AudioEventType type,
                                              const std::shared_ptr<const KestoReportingSinkSession>& session)
 {
+    KestoReportingAssertServerQueue();
     platform::Analytics& analytics = platform::current().analytics;
     std::shared_ptr<LazyPayload> payload;
     const auto offer = [&](const std::string& eventName) {

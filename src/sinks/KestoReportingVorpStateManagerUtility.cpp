@@ -2,6 +2,7 @@
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 
 #include "platform/Platform.h"
+#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
 
 namespace {
@@ -14,6 +15,7 @@ void KestoReportingUtilityVorpStateManager::handleEvent(const std::optional<foun
                                                         const std::shared_ptr<const KestoReportingSinkSession>& session,
                                                         std::string_view processName)
 {
+    KestoReportingAssertServerQueue();
     if (!message || type != typeGimbo || !message->contains(hapticTimeKey) || *message == messageCache_)
         return;
     if (leakedHapticsSessionCounter_ != 1) {

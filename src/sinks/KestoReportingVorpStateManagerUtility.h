@@ -10,7 +10,7 @@
 #include <optional>
 #include <string_view>
 
-// Has no lock: its callers hand it one message at a time.
+// On the server queue, so it needs no lock.
 class KestoReportingUtilityVorpStateManager {
 public:
     // A message of a session, sent by a process of that name. No message is ignored.

@@ -120,7 +120,7 @@ TEST_F(MessagesTest, SkipZeroAndIDsThatNobodyHas)
 {
     makeSession(player, 42);
     makeSession(player, 0, false);
-    player.session(0)->start();
+    support::onServerQueue(harness.platform.workQueues, [&] { player.session(0)->start(); });
     harness.forget();
     EXPECT_EQ(send(player, Array{0, 99}), answeredOnce(delivered));
     EXPECT_THAT(platform.analytics.asked(), IsEmpty());
@@ -227,7 +227,7 @@ TEST_F(MessagesTest, WithoutAListReachTheStartedSessionsOfAllClients)
 TEST_F(MessagesTest, WithoutAListReachAStartedSessionZeroToo)
 {
     makeSession(player, 0, false);
-    player.session(0)->start();
+    support::onServerQueue(harness.platform.workQueues, [&] { player.session(0)->start(); });
     send(player, null);
     EXPECT_NE(recorded(player, 0), std::nullopt);
 }
@@ -573,7 +573,7 @@ TEST_F(ClientAndServiceTest, PaysForItsMessagesFromTheServicesBudget)
     const auto& budget = KestoReportingStorageBudget::service();
     const std::size_t before = budget->taken();
     createSession(42);
-    session(42)->start();
+    support::onServerQueue(platform.workQueues, [&] { session(42)->start(); });
     EXPECT_THAT(send(std::vector<std::int64_t>{42}), SizeIs(1));
     EXPECT_GT(budget->taken(), before);
     client.reset();

@@ -610,7 +610,7 @@ TEST_F(ClientTest, StopsNoSessionThatItDoesNotHave)
 TEST_F(ClientTest, AnswersTheStopOfSessionZeroWithoutAnotherWord)
 {
     create(0);
-    player.session(0)->start();
+    support::onServerQueue(harness.platform.workQueues, [&] { player.session(0)->start(); });
     harness.forget();
     EXPECT_EQ(stop(0), answeredOnce(succeeded));
     EXPECT_TRUE(player.session(0)->started());

@@ -282,7 +282,7 @@ TEST(ServiceDriverStatistics, AreTakenAndReportedByItsSampler)
     const auto snapShot = onQueue([&] { return harness.service->getSnapShot(); });
     ASSERT_THAT(snapShot, SizeIs(1));
     EXPECT_EQ(snapShot.begin()->first, "Speaker-(null)");
-    session->setDriverSnapShot(snapShot);
+    onQueue([&] { session->setDriverSnapShot(snapShot); });
     underruns.value = 8;
     harness.platform.reportingChannels.publish(underruns);
     onQueue([&](platform::Turn& turn) { harness.service->sendDriverLogsForSession(turn, session); });

@@ -23,6 +23,7 @@ public:
 
     void add(TurnItem item)
     {
+        assert(!mayBeHelped_ || !thisThread.isHelper || !foundation::Lock::isAnyHeld());
         const bool mayHelp = mayBeHelped_ && thisThread.mayHelp(this);
         if (mayHelp && thisThread.toHelp == nullptr)
             thisThread.toHelp = shared_from_this();

@@ -1,5 +1,6 @@
 // Real threads, which are made to meet at the moments that matter by letting them wait for each other, never for a
 // while.
+#include "foundation/Mutex.h"
 #include "platform/Turn.h"
 #include "platform/linux/NoThreads.h"
 #include "platform/linux/process/Thread.h"
@@ -376,6 +377,25 @@ TEST_F(WorkQueuesTest, OnlyQueuesThatMayBeHelpedAre)
     const auto done = queues.makeSemaphore(0);
     queue->submit([&] { done->signal(); });
     done->wait(); // which its own thread must have run
+}
+
+TEST_F(WorkQueuesTest, AThreadThatHelpsHoldsNoLockWhileItSubmits)
+{
+    GTEST_FLAG_SET(death_test_style, "threadsafe");
+    foundation::Mutex mutex;
+    {
+        const auto helpedByOthers = queues.makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
+        const foundation::Lock lock(mutex);
+        helpedByOthers->submit([] { }); // which this thread never runs
+    }
+    EXPECT_DEBUG_DEATH(
+        {
+            const auto helped = queues.makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
+            const SerialQueue::Helper helper;
+            const foundation::Lock lock(mutex);
+            helped->submit([] { });
+        },
+        "isAnyHeld");
 }
 
 TEST_F(WorkQueuesTest, AQueueThatGoesRunsWhatWasSubmittedBefore)
