@@ -120,19 +120,18 @@ bool KestoReportingMessageStore::append(std::uint32_t kind, const foundation::Di
     const bool isLarge = bytes > largestEncoded && textSize(payload) > largestEncoded;
     if (isLarge && !share_.grow(bytes))
         return false;
-    scratch_.clear();
-    if (!isLarge)
-        foundation::appendCbor(payload, scratch_);
-    const Head head{kind, isLarge, static_cast<std::uint32_t>(scratch_.size())};
-    char* place = allocate(sizeof head + scratch_.size());
+    const std::size_t size = isLarge ? 0 : foundation::cborSize(payload);
+    const Head head{kind, isLarge, static_cast<std::uint32_t>(size)};
+    char* place = allocate(sizeof head + size);
     if (place == nullptr) {
         if (isLarge)
             share_.shrink(bytes);
         return false;
     }
     std::memcpy(place, &head, sizeof head);
-    std::memcpy(place + sizeof head, scratch_.data(), scratch_.size());
-    appended.encoded_ = {place + sizeof head, scratch_.size()};
+    appended.encoded_ = {place + sizeof head, size};
+    if (!isLarge)
+        foundation::putCbor(payload, place + sizeof head);
     appended.kept_ = isLarge ? &keptAside_.emplace_back(payload) : nullptr;
     return true;
 }

@@ -139,7 +139,6 @@ private:
     std::unordered_map<std::string, std::uint32_t> kindByKey_;
     std::optional<Recent> recent_; // the kind of the message before this one
     std::size_t size_ = 0;
-    std::string scratch_;
 };
 
 inline bool KestoReportingMessageStore::Cursor::next()

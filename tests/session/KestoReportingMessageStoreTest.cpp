@@ -2,6 +2,7 @@
 // is found by walking back from the end. And what hostile messages cost it.
 #include "session/KestoReportingMessageStore.h"
 #include "foundation/cbor/Cbor.h"
+#include "session/AllocatedBytes.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>
@@ -333,6 +334,38 @@ TEST(MessageStore, PaysNothingForALargePayloadThatItCannotKeep)
 
 // Every category and type that a client can name apart, of which it could otherwise have as many for nothing as it has
 // sessions.
+TEST(MessageStore, TakesNoMemoryForAMessageThatItsBudgetHasNoRoomFor)
+{
+    const auto budget = std::make_shared<KestoReportingStorageBudget>(4096);
+    KestoReportingMessageStore store(budget);
+    const Dictionary message{{"a", std::string(1'000'000, 'x')}};
+    const auto before = allocatedBytes();
+    forgetMostAllocatedBytes();
+    EXPECT_EQ(store.record(4, 1, message), Outcome::Full);
+    EXPECT_LT(mostAllocatedBytes() - before, 4096) << "not even for a moment";
+}
+
+TEST(MessageStore, PaysForAllThatItTakes)
+{
+    const auto budget = plenty();
+    KestoReportingMessageStore store(budget);
+    const Dictionary message{{"a", std::string(1'000'000, 'x')}};
+    const auto before = allocatedBytes();
+    EXPECT_EQ(store.record(4, 1, message), Outcome::Recorded);
+    EXPECT_LE(allocatedBytes() - before, static_cast<std::ptrdiff_t>(budget->taken()) + 4096);
+}
+
+TEST(MessageStore, TakesNoMoreForSmallNumbersThanTheirEncoding)
+{
+    const auto budget = plenty();
+    KestoReportingMessageStore store(budget);
+    const Dictionary message{{"a", Array(std::vector<Value>(1'000'000, Value(1)))}};
+    const auto before = allocatedBytes();
+    forgetMostAllocatedBytes();
+    EXPECT_EQ(store.record(4, 1, message), Outcome::Recorded);
+    EXPECT_LT(mostAllocatedBytes() - before, 1'010'000);
+}
+
 TEST(MessageStore, PaysForEveryKindOfMessage)
 {
     const auto budget = plenty();

@@ -72,33 +72,106 @@ void appendHead(Major major, std::uint64_t argument, std::string& out)
     append(longestHead, out, [&](char* place) { return putHead(major, argument, place); });
 }
 
-char* putBytes(Major major, std::string_view bytes, char* place) noexcept
+// How many bytes the shortest head takes.
+std::size_t headSize(std::uint64_t argument) noexcept
 {
-    place = putHead(major, bytes.size(), place);
-    return place + bytes.copy(place, bytes.size());
+    if (argument < 24)
+        return 1;
+    if (argument <= std::numeric_limits<std::uint8_t>::max())
+        return 2;
+    if (argument <= std::numeric_limits<std::uint16_t>::max())
+        return 3;
+    return argument <= std::numeric_limits<std::uint32_t>::max() ? 5 : longestHead;
 }
 
-char* putSimple(Head::Simple simple, char* place) noexcept
+// What an encoding is made of goes to memory, or is only counted: so its size is known before there is memory for it.
+struct Place {
+    char* at;
+
+    void head(Major major, std::uint64_t argument) noexcept { at = putHead(major, argument, at); }
+    void bytes(std::string_view bytes) noexcept { at += bytes.copy(at, bytes.size()); }
+    template <typename Integer> void bigEndian(Integer value) noexcept { at = putBigEndian(value, at); }
+};
+struct Size {
+    std::size_t count = 0;
+
+    void head(Major, std::uint64_t argument) noexcept { count += headSize(argument); }
+    void bytes(std::string_view bytes) noexcept { count += bytes.size(); }
+    template <typename Integer> void bigEndian(Integer) noexcept { count += sizeof(Integer); }
+};
+
+template <typename Out> void putBytes(Major major, std::string_view bytes, Out& out) noexcept
 {
-    *place = static_cast<char>(static_cast<unsigned>(Major::Simple) << 5 | simple);
-    return place + 1;
+    out.head(major, bytes.size());
+    out.bytes(bytes);
 }
 
-char* putNumber(Number number, char* place) noexcept
+template <typename Out> void putSimple(Head::Simple simple, Out& out) noexcept
+{
+    const char byte = static_cast<char>(static_cast<unsigned>(Major::Simple) << 5 | simple);
+    out.bytes({&byte, 1});
+}
+
+template <typename Out> void put(Number number, Out& out) noexcept
 {
     switch (number.kind()) {
-    case Number::Kind::Boolean: return putSimple(number.booleanValue() ? True : False, place);
+    case Number::Kind::Boolean: return putSimple(number.booleanValue() ? True : False, out);
     case Number::Kind::Float32:
-        return putBigEndian(std::bit_cast<std::uint32_t>(static_cast<float>(number.doubleValue())),
-                            putSimple(Float32, place));
+        putSimple(Float32, out);
+        return out.bigEndian(std::bit_cast<std::uint32_t>(static_cast<float>(number.doubleValue())));
     case Number::Kind::Float64:
-        return putBigEndian(std::bit_cast<std::uint64_t>(number.doubleValue()), putSimple(Float64, place));
-    case Number::Kind::Unsigned64: return putHead(Major::Unsigned, *number.exactly<std::uint64_t>(), place);
+        putSimple(Float64, out);
+        return out.bigEndian(std::bit_cast<std::uint64_t>(number.doubleValue()));
+    case Number::Kind::Unsigned64: return out.head(Major::Unsigned, *number.exactly<std::uint64_t>());
     case Number::Kind::Signed64: break;
     }
     const std::int64_t value = number.int64Value();
-    return value >= 0 ? putHead(Major::Unsigned, static_cast<std::uint64_t>(value), place)
-                      : putHead(Major::Negative, ~static_cast<std::uint64_t>(value), place);
+    if (value >= 0)
+        out.head(Major::Unsigned, static_cast<std::uint64_t>(value));
+    else
+        out.head(Major::Negative, ~static_cast<std::uint64_t>(value));
+}
+
+template <typename Out> void put(const Dictionary& dictionary, Out& out) noexcept;
+
+template <typename Out> void put(const Value& value, Out& out) noexcept
+{
+    switch (value.kind()) {
+    case Value::Kind::Null: return putSimple(Null, out);
+    case Value::Kind::Number: return put(*value.number(), out);
+    case Value::Kind::String: return putBytes(Major::Text, value.stringView(), out);
+    case Value::Kind::Dictionary: return put(*value.dictionary(), out);
+    case Value::Kind::Data: return putBytes(Major::Bytes, value.data()->bytes, out);
+    case Value::Kind::Date: out.head(Major::Tag, epochDateTag); return put(Number(value.date()->secondsSince1970), out);
+    case Value::Kind::Array: break;
+    }
+    const Array array = *value.array();
+    out.head(Major::Array, array.size());
+    for (const Value& element : array)
+        put(element, out);
+}
+
+template <typename Out> void put(const Dictionary& dictionary, Out& out) noexcept
+{
+    out.head(Major::Map, dictionary.size());
+    for (const auto& [key, value] : dictionary) {
+        putBytes(Major::Text, key, out);
+        put(value, out);
+    }
+}
+
+template <typename Item> std::size_t sizeOf(const Item& item) noexcept
+{
+    Size size;
+    put(item, size);
+    return size.count;
+}
+
+template <typename Item> char* putAt(const Item& item, char* place) noexcept
+{
+    Place out{place};
+    put(item, out);
+    return out.at;
 }
 
 float widenHalf(std::uint16_t half) noexcept // RFC 8949, appendix D
@@ -136,7 +209,11 @@ void appendCborInteger(std::uint64_t value, std::string& out)
 
 void appendCborText(std::string_view text, std::string& out)
 {
-    append(longestHead + text.size(), out, [&](char* place) { return putBytes(Major::Text, text, place); });
+    append(longestHead + text.size(), out, [text](char* place) {
+        Place end{place};
+        putBytes(Major::Text, text, end);
+        return end.at;
+    });
 }
 
 void appendCborArrayHead(std::uint64_t count, std::string& out)
@@ -149,83 +226,24 @@ void appendCborMapHead(std::uint64_t count, std::string& out)
     appendHead(Major::Map, count, out);
 }
 
-namespace {
-
-std::size_t mostBytes(const Dictionary& dictionary) noexcept;
-
-// What the encoding takes at most: as if every head were the longest.
-std::size_t mostBytes(const Value& value) noexcept
-{
-    switch (value.kind()) {
-    case Value::Kind::String: return longestHead + value.stringView().size();
-    case Value::Kind::Dictionary: return mostBytes(*value.dictionary());
-    case Value::Kind::Array: {
-        std::size_t bytes = longestHead;
-        const Array array = *value.array();
-        for (const Value& element : array)
-            bytes += mostBytes(element);
-        return bytes;
-    }
-    case Value::Kind::Data: return longestHead + value.data()->bytes.view().size();
-    case Value::Kind::Date: return 2 * longestHead;
-    default: return longestHead;
-    }
-}
-
-std::size_t mostBytes(const Dictionary& dictionary) noexcept
-{
-    std::size_t bytes = longestHead;
-    for (const auto& [key, value] : dictionary)
-        bytes += longestHead + key.view().size() + mostBytes(value);
-    return bytes;
-}
-
-char* put(const Dictionary& dictionary, char* place) noexcept;
-
-char* put(const Value& value, char* place) noexcept
-{
-    switch (value.kind()) {
-    case Value::Kind::Null: return putSimple(Null, place);
-    case Value::Kind::Number: return putNumber(*value.number(), place);
-    case Value::Kind::String: return putBytes(Major::Text, value.stringView(), place);
-    case Value::Kind::Dictionary: return put(*value.dictionary(), place);
-    case Value::Kind::Data: return putBytes(Major::Bytes, value.data()->bytes, place);
-    case Value::Kind::Date:
-        return putNumber(Number(value.date()->secondsSince1970), putHead(Major::Tag, epochDateTag, place));
-    case Value::Kind::Array: break;
-    }
-    const Array array = *value.array();
-    place = putHead(Major::Array, array.size(), place);
-    for (const Value& element : array)
-        place = put(element, place);
-    return place;
-}
-
-char* put(const Dictionary& dictionary, char* place) noexcept
-{
-    place = putHead(Major::Map, dictionary.size(), place);
-    for (const auto& [key, value] : dictionary)
-        place = put(value, putBytes(Major::Text, key, place));
-    return place;
-}
-
-} // namespace
-
 void appendCbor(const Dictionary& dictionary, std::string& out)
 {
-    append(mostBytes(dictionary), out, [&](char* place) { return put(dictionary, place); });
+    append(sizeOf(dictionary), out, [&](char* place) { return putAt(dictionary, place); });
 }
 
 void appendCbor(const Value& value, std::string& out)
 {
-    append(mostBytes(value), out, [&](char* place) { return put(value, place); });
+    append(sizeOf(value), out, [&](char* place) { return putAt(value, place); });
 }
 
-std::size_t cborSize(const Dictionary& dictionary)
+std::size_t cborSize(const Dictionary& dictionary) noexcept
 {
-    std::string encoded;
-    appendCbor(dictionary, encoded);
-    return encoded.size();
+    return sizeOf(dictionary);
+}
+
+char* putCbor(const Dictionary& dictionary, char* place) noexcept
+{
+    return putAt(dictionary, place);
 }
 
 namespace {

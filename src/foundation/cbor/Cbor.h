@@ -42,8 +42,9 @@ constexpr unsigned cborMaximumDepth = 32;
 void appendCbor(const Value& value, std::string& out);
 void appendCbor(const Dictionary& dictionary, std::string& out);
 
-// How many bytes that encoding takes.
-[[nodiscard]] std::size_t cborSize(const Dictionary& dictionary);
+// How many bytes that encoding takes, and the encoding where there is room for so many; returns where it ends.
+[[nodiscard]] std::size_t cborSize(const Dictionary& dictionary) noexcept;
+char* putCbor(const Dictionary& dictionary, char* place) noexcept;
 
 // The heads by which whoever knows a message's shape encodes it without building values first.
 void appendCborInteger(std::uint64_t value, std::string& out);

@@ -1,6 +1,7 @@
 // What is written is read back the same; and the heads that callers write by hand fit what values write.
 #include "foundation/cbor/Cbor.h"
 
+#include "foundation/LargestAllocation.h"
 #include "foundation/cbor/Hex.h"
 #include "foundation/values/GeneratedValues.h"
 
@@ -95,10 +96,40 @@ TEST(Cbor, AMessageWrittenByHandIsTheMessageWrittenAsAValue)
     EXPECT_EQ(bytes, encoded(Array{7U, Value(), Dictionary{{"mute", "no"}}}));
 }
 
-TEST(Cbor, SizeIsThatOfTheEncoding)
+RC_GTEST_PROP(CborProperty, SizeIsThatOfTheEncoding, ())
 {
-    const Dictionary dictionary{{"gain", 0.5F}, {"devices", Array{"Speaker"}}};
-    EXPECT_EQ(cborSize(dictionary), encoded(dictionary).size());
+    const Dictionary dictionary{{"gain", 0.5F}, {"value", *generated::value()}};
+    RC_ASSERT(cborSize(dictionary) == encoded(dictionary).size());
+}
+
+TEST(Cbor, SizeIsThatOfTheShortestHeads)
+{
+    const auto sizeOf = [](const Value& value) { return cborSize({{"a", value}}) - cborSize({{"a", Value()}}) + 1; };
+    EXPECT_EQ(sizeOf(23), 1U);
+    EXPECT_EQ(sizeOf(24), 2U);
+    EXPECT_EQ(sizeOf(-24), 1U);
+    EXPECT_EQ(sizeOf(-257), 3U);
+    EXPECT_EQ(sizeOf(0xFFFF), 3U);
+    EXPECT_EQ(sizeOf(0x10000), 5U);
+    EXPECT_EQ(sizeOf(0xFFFFFFFFU), 5U);
+    EXPECT_EQ(sizeOf(std::numeric_limits<std::uint64_t>::max()), 9U);
+    EXPECT_EQ(sizeOf(true), 1U);
+    EXPECT_EQ(sizeOf(0.5F), 5U);
+    EXPECT_EQ(sizeOf(0.5), 9U);
+    EXPECT_EQ(sizeOf(Date{0}), 10U);
+    EXPECT_EQ(sizeOf(Data{std::string_view("abc")}), 4U);
+    EXPECT_EQ(sizeOf(std::string(24, 'x')), 26U);
+    EXPECT_EQ(sizeOf(Dictionary{{"b", Array{1}}}), 5U);
+}
+
+TEST(Cbor, AsksForNoMoreMemoryThanTheEncodingTakes)
+{
+    const Value numbers = Array(std::vector<Value>(100'000, Value(1)));
+    std::string bytes;
+    forgetAllocations();
+    appendCbor(numbers, bytes);
+    EXPECT_EQ(bytes.size(), 100'005U);
+    EXPECT_LE(largestAllocation(), 100'006U);
 }
 
 TEST(Cbor, IsAppended)
