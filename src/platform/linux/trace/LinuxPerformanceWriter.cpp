@@ -50,8 +50,7 @@ public:
     void write(std::string_view name, double value, PerformanceUnit unit) override
     {
         constexpr std::size_t large = std::size_t{64} << 10;
-        rememberName(name);
-        if (room_ < nameText_.size() + mostBesideName) {
+        if (!hasRoomFor(name)) {
             ++lost_;
             return;
         }
@@ -79,6 +78,19 @@ public:
     }
 
 private:
+    // The length alone tells most of what does not fit: reading a long name once for each value that is lost would take
+    // minutes. As JSON text a name is longer yet, so one that did not fit leaves room only for shorter ones.
+    bool hasRoomFor(std::string_view name)
+    {
+        if (room_ < name.size() + mostBesideName)
+            return false;
+        rememberName(name);
+        if (room_ >= nameText_.size() + mostBesideName)
+            return true;
+        room_ = name.size() + mostBesideName - 1;
+        return false;
+    }
+
     // Values of one name come in a row.
     void rememberName(std::string_view name)
     {

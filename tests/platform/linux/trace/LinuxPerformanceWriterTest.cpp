@@ -7,6 +7,7 @@
 
 #include <gmock/gmock.h>
 #include <limits>
+#include <sys/mman.h>
 
 namespace {
 
@@ -16,6 +17,7 @@ using platform::PerformanceUnit;
 using support::IsLine;
 using support::readFile;
 using testing::ElementsAre;
+using testing::EndsWith;
 using testing::IsEmpty;
 using testing::StartsWith;
 
@@ -127,6 +129,53 @@ TEST_F(PerformanceWriter, LosesRecordsThatWouldMakeTheFileTooLargeAndSaysHowMany
 )");
     EXPECT_THAT(log.lines(),
                 ElementsAre(IsLine(Error, "kerl", path.string() + " has become too large; 2 records are lost")));
+}
+
+// So long a name, which ends the test program when it is read.
+class UnreadableName {
+public:
+    explicit UnreadableName(std::size_t size)
+        : size_(size),
+          place_(::mmap(nullptr, size, PROT_NONE, MAP_PRIVATE | MAP_ANONYMOUS, -1, 0))
+    {
+    }
+    ~UnreadableName() { ::munmap(place_, size_); }
+    UnreadableName(const UnreadableName&) = delete;
+    UnreadableName& operator=(const UnreadableName&) = delete;
+
+    [[nodiscard]] std::string_view text() const { return {static_cast<const char*>(place_), size_}; }
+
+private:
+    const std::size_t size_;
+    void* const place_;
+};
+
+TEST_F(PerformanceWriter, DoesNotReadANameThatIsLongerThanTheRoom)
+{
+    constexpr std::size_t largest = 1000;
+    const UnreadableName name(largest);
+    platform::LinuxPerformanceWriter limited(files, platform::ProviderLog(log), largest);
+    auto file = limited.open(path, "p", 1);
+    file->write(name.text(), 1, PerformanceUnit::Nanoseconds);
+    file.reset();
+    EXPECT_THAT(readFile(path), EndsWith("\n],\"lostValues\":1}\n"));
+}
+
+TEST_F(PerformanceWriter, DoesNotReadANameAsLongAsOneThatDidNotFitAsJsonText)
+{
+    constexpr std::size_t largest = 1000;
+    constexpr std::size_t size = 500;
+    const UnreadableName name(size);
+    platform::LinuxPerformanceWriter limited(files, platform::ProviderLog(log), largest);
+    auto file = limited.open(path, "p", 1);
+    file->write(std::string(size, '\x01'), 1, PerformanceUnit::Nanoseconds);
+    file->write(name.text(), 2, PerformanceUnit::Nanoseconds);
+    file->write("b", 3, PerformanceUnit::Nanoseconds);
+    file.reset();
+    EXPECT_EQ(readFile(path), R"({"project":"p","version":1,"records":[
+{"name":"b","value":3,"unit":"ns"}
+],"lostValues":2}
+)");
 }
 
 TEST_F(PerformanceWriter, PutsTheFileInThePlaceOfALinkAndLeavesAloneWhatItPointedTo)
