@@ -8,6 +8,12 @@
 namespace {
 constexpr AudioEventType typeGimbo = 8;
 constexpr std::string_view hapticTimeKey = "Haptic_Active_Hardware_Time_Seconds";
+
+// A message that goes to several sessions is one report, though it may hold a NaN, which equals nothing.
+bool isRepeat(const foundation::Dictionary& message, const foundation::Dictionary& last)
+{
+    return message.isSameObject(last) || message == last;
+}
 } // namespace
 
 void KestoReportingUtilityVorpStateManager::handleEvent(const std::optional<foundation::Dictionary>& message,
@@ -16,7 +22,7 @@ void KestoReportingUtilityVorpStateManager::handleEvent(const std::optional<foun
                                                         std::string_view processName)
 {
     KestoReportingAssertServerQueue();
-    if (!message || type != typeGimbo || !message->contains(hapticTimeKey) || *message == messageCache_)
+    if (!message || type != typeGimbo || !message->contains(hapticTimeKey) || isRepeat(*message, messageCache_))
         return;
     if (leakedHapticsSessionCounter_ != 1) {
         messageCache_ = *message;

@@ -131,6 +131,23 @@ TEST_F(VorpStateManagerTest, IgnoresARepeatOfTheReportCountedLast)
     EXPECT_THAT(snapshots(), IsEmpty());
 }
 
+TEST_F(VorpStateManagerTest, IgnoresTheSameMessageSentToAnotherSessionThoughItHoldsWhatIsNoNumber)
+{
+    const Dictionary message = hapticTime(std::numeric_limits<double>::quiet_NaN());
+    send(message);
+    send(message);
+    EXPECT_EQ(manager.leakedHapticsSessionCounter(), 1U);
+    EXPECT_THAT(snapshots(), IsEmpty());
+}
+
+TEST_F(VorpStateManagerTest, TellsTwoMessagesApartThatHoldWhatIsNoNumber)
+{
+    send(hapticTime(std::numeric_limits<double>::quiet_NaN()));
+    send(hapticTime(std::numeric_limits<double>::quiet_NaN()));
+    EXPECT_EQ(manager.leakedHapticsSessionCounter(), 0U);
+    EXPECT_THAT(snapshots(), SizeIs(1));
+}
+
 TEST_F(VorpStateManagerTest, TheOrderOfEntriesMakesNoOtherReport)
 {
     send(a.with("x", 1).with("y", 2));
