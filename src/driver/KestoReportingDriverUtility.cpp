@@ -45,7 +45,7 @@ void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver)
         return;
     }
     auto subscribed = service.createSubscription(*found.channels);
-    if (subscribed.channels) {
+    if (subscribed.subscription && subscribed.channels) {
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "subscribed to group group {}-{}", group, subgroup);
         ioChannelSubscriptions_.push_back(
             {std::move(driver), std::move(subscribed.subscription), std::move(subscribed.channels)});

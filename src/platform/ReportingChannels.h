@@ -67,6 +67,7 @@ public:
         std::shared_ptr<ChannelSet> channels; // null: nothing came back
         std::optional<ReportingChannelError> error;
     };
+    // Sampling takes both; one without the other counts as nothing.
     struct Subscribed {
         std::shared_ptr<Subscription> subscription;
         std::shared_ptr<ChannelSet> channels; // null: nothing came back

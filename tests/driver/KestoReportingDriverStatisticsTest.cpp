@@ -187,10 +187,10 @@ TEST(HistogramData, ReportsABucketOfWhichHitsWentDown)
 TEST(HistogramData, GoesOnWithWhateverBoundsWereRead)
 {
     const support::TestPlatform platform;
-    EXPECT_EQ(
-        said(processHistogramData,
-             histogram({{.lower = 0, .upper = 10, .hits = 5}, {.lower = 0, .upper = 0, .hits = 2, .boundsError = 22}})),
-        Value("count=2,lower=0,upper=10,min=3,max=37,unit=ms::0-10:5;0-0:2"));
+    EXPECT_EQ(said(processHistogramData,
+                   histogram({{.lower = 0, .upper = 10, .hits = 5},
+                              {.lower = -5, .upper = 50, .hits = 2, .boundsError = 22}})),
+              Value("count=2,lower=-5,upper=50,min=3,max=37,unit=ms::0-10:5;-5-50:2"));
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerd", "Error in getting the bucket bounds : 22")));
 }
 
@@ -234,6 +234,13 @@ TEST(StateData, IsLoggedForWhoDebugs)
                 ElementsAre(IsLine(Debug, "kerd",
                                    "the current reported data is : "
                                    "name:On,transition:1,residency:2,duty_cycle:1.000000;")));
+}
+
+TEST(StateData, IsLoggedEvenWhenItIsEmpty)
+{
+    const support::TestPlatform platform;
+    said(processStateData, states({{.name = "On", .transitions = 1, .residency = 0}}));
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerd", "the current reported data is : ")));
 }
 
 // --- a session's driver logs
@@ -322,6 +329,18 @@ TEST_F(DriverLogs, TellTheSessionFirstAndThenTheAnalyticsBridge)
     EXPECT_THAT(steps,
                 ElementsAre("session", "com.quarn.kesto.Cavlet.Simple", "com.quarn.longformaudio.Cavlet.Simple",
                             "session", "com.quarn.kesto.Cavlet.State", "com.quarn.longformaudio.Cavlet.State"));
+}
+
+TEST_F(DriverLogs, SayThatSamplesAreTakenBeforeTheyAreAndThatTheyWereBehindIt)
+{
+    publish(simple(10));
+    begin();
+    std::vector<std::string> steps;
+    platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
+    platform.reportingChannels.setSampleObserver([&] { steps.emplace_back("sample"); });
+    end();
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(steps, ElementsAre("getting latest samples", "sample", "done getting latest samples"));
 }
 
 TEST_F(DriverLogs, AreNoneWhenNothingChanged)

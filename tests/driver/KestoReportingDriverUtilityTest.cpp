@@ -141,6 +141,46 @@ TEST_F(DriverUtility, GoesOnWithChannelsThatCameBackBesideAnError)
     EXPECT_THAT(descriptions(utility), SizeIs(8));
 }
 
+TEST_F(DriverUtility, SaysBothThatAnErrorCameBackAndThatThereAreNoChannelsBesideIt)
+{
+    auto& failures = channels.failures("Rx", std::nullopt);
+    failures.copy = 7;
+    failures.copiesAnyway = true;
+    const KestoReportingDriverUtility utility;
+    const auto lines = platform.log.lines();
+    ASSERT_THAT(lines, SizeIs(10));
+    EXPECT_THAT(lines[6], IsLine(Error, "kerd", "error 7 getting channels for driver Rx-(null)"));
+    EXPECT_THAT(lines[7], IsLine(Info, "kerd", "couldn't find any channels for driver group Rx-(null)"));
+}
+
+TEST_F(DriverUtility, SubscribesToWhatCameBackBesideAnErrorAndDoesNotSayTheError)
+{
+    channels.publish(channelOf("Rx", std::nullopt));
+    auto& failures = channels.failures("Rx", std::nullopt);
+    failures.subscription = 9;
+    failures.subscribesAnyway = true;
+    const KestoReportingDriverUtility utility;
+    EXPECT_THAT(platform.log.lines(), Contains(IsLine(Info, "kerd", "subscribed to group group Rx-(null)")));
+    EXPECT_THAT(platform.log.lines(),
+                Not(Contains(IsLine(Error, "kerd", "error 9 creating subscription for Rx-(null)"))));
+    EXPECT_THAT(utility.getSnapShot(), SizeIs(1));
+}
+
+TEST_F(DriverUtility, LeavesOutADriverWithChannelsButWithoutASubscription)
+{
+    publishAll();
+    channels.failures("Rx", std::nullopt).subscribesWithoutHandle = true;
+    auto& failures = channels.failures("Tx", std::nullopt);
+    failures.subscribesWithoutHandle = true;
+    failures.subscription = 9;
+    failures.subscribesAnyway = true;
+    const KestoReportingDriverUtility utility;
+    EXPECT_THAT(descriptions(utility), SizeIs(6));
+    EXPECT_THAT(utility.getSnapShot(), SizeIs(6));
+    EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerd", "error 9 creating subscription for Tx-(null)")));
+    EXPECT_THAT(platform.log.lines(), Not(Contains(IsLine(Info, "kerd", "subscribed to group group Rx-(null)"))));
+}
+
 TEST_F(DriverUtility, LeavesOutADriverThatCannotBeSubscribedTo)
 {
     publishAll();
@@ -187,6 +227,18 @@ TEST_F(DriverUtility, TakesASnapshotOfEveryDriverUnderItsDescription)
     ASSERT_THAT(lines, SizeIs(8));
     EXPECT_THAT(lines[0], IsLine(Info, "kerd", "sampling driver QuarnZT4-(null)"));
     EXPECT_THAT(lines[2], IsLine(Info, "kerd", "sampling driver (null)-MCA"));
+}
+
+TEST_F(DriverUtility, SaysWhichDriverItSamplesBeforeItDoes)
+{
+    channels.publish(channelOf("Rx", std::nullopt));
+    const KestoReportingDriverUtility utility;
+    std::vector<std::string> steps;
+    platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
+    channels.setSampleObserver([&] { steps.emplace_back("sample"); });
+    EXPECT_THAT(utility.getSnapShot(), SizeIs(1));
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(steps, ElementsAre("sampling driver Rx-(null)", "sample"));
 }
 
 TEST_F(DriverUtility, KeepsTheOtherDriversWhenOneCannotBeSampled)

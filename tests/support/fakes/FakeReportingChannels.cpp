@@ -79,16 +79,20 @@ std::size_t FakeReportingChannels::channelCount(const ChannelSet& channels) cons
 platform::ReportingChannels::Subscribed FakeReportingChannels::createSubscription(const ChannelSet& channels)
 {
     const auto& selection = dynamic_cast<const Selection&>(channels);
-    auto subscription = std::make_shared<Subscription>();
     const Failures& failing = failures(selection.group, selection.subgroup);
-    if (failing.subscribesToNothing || failing.subscription)
+    auto subscription = failing.subscribesWithoutHandle ? nullptr : std::make_shared<Subscription>();
+    if (failing.subscribesToNothing || (failing.subscription && !failing.subscribesAnyway))
         return {.subscription = std::move(subscription), .channels = nullptr, .error = failing.subscription};
-    return {.subscription = std::move(subscription), .channels = std::make_shared<Selection>(selection), .error = {}};
+    return {.subscription = std::move(subscription),
+            .channels = std::make_shared<Selection>(selection),
+            .error = failing.subscription};
 }
 
 std::expected<ReportingSample, platform::ReportingChannelError>
 FakeReportingChannels::createSamples(const Subscription&, const ChannelSet& channels)
 {
+    if (sampleObserver_)
+        sampleObserver_();
     const auto& selection = dynamic_cast<const Selection&>(channels);
     if (const auto error = failures(selection.group, selection.subgroup).sample)
         return std::unexpected(*error);

@@ -3,6 +3,7 @@
 
 #include "platform/ReportingChannels.h"
 
+#include <functional>
 #include <map>
 #include <optional>
 #include <string>
@@ -24,6 +25,8 @@ public:
         bool copiesNothing = false; // neither channels nor an error come back
         std::optional<Error> subscription;
         bool subscribesToNothing = false; // likewise
+        bool subscribesAnyway = false; // channels come back beside the error
+        bool subscribesWithoutHandle = false; // channels come back, and no subscription
         std::optional<Error> sample;
     };
 
@@ -32,6 +35,8 @@ public:
     void withdraw(const platform::ReportingChannel& channel);
     void withdrawAll() { channels_.clear(); }
     Failures& failures(Name group, Name subgroup) { return failures_[{std::move(group), std::move(subgroup)}]; }
+    // Is told of every sample before it is taken.
+    void setSampleObserver(std::function<void()> observer) { sampleObserver_ = std::move(observer); }
     void failDifferences(std::optional<Error> error) { differenceError_ = error; }
 
     // The groups and subgroups that were asked for, in order.
@@ -54,6 +59,7 @@ private:
     std::vector<platform::ReportingChannel> channels_;
     std::map<std::pair<Name, Name>, Failures> failures_;
     std::optional<Error> differenceError_;
+    std::function<void()> sampleObserver_;
     std::vector<std::pair<Name, Name>> asked_;
 };
 
