@@ -239,6 +239,7 @@ void KestoReportingSession::writeSummaryJson() const
         KESTO_LOG(KestoReportingSessionCategory(), Error, "dataWithJSONObject: a number is not finite");
         if (file)
             (*file)->clear();
+        bytes = 0;
     }
     if (!directoryMade)
         KESTO_LOG(KestoReportingSessionCategory(), Error, "can't create logging directory at {}: {}",

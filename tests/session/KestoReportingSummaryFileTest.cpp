@@ -273,6 +273,15 @@ TEST_F(SummaryFile, IsOneOfAsManyAsAreKept)
         EXPECT_FALSE(kept.isOne(other)) << other;
 }
 
+TEST_F(SummaryFile, CountsForNothingWhenItIsEmpty)
+{
+    record({{"before", std::string(200'000, 'x')}});
+    record({{"a", std::numeric_limits<double>::quiet_NaN()}});
+    EXPECT_EQ(write().second, "");
+    ASSERT_THAT(platform.fileSystem.keptWithin, SizeIs(1));
+    EXPECT_EQ(platform.fileSystem.keptWithin.front().bytes, 0U);
+}
+
 TEST_F(SummaryFile, IsNotCountedWhenItWasNotWritten)
 {
     platform.fileSystem.writeError = std::make_error_code(std::errc::no_space_on_device);
