@@ -74,7 +74,9 @@ public:
     void setupTracing(const std::optional<std::string>& fileName);
     // Whether a trace of this session is running. One that is running when the session goes, goes with it.
     [[nodiscard]] bool startedTracing() const { return startedTracing_; }
-    // Of the trace that is running or prepared, or was the last.
+    // In bytes, as of any path. A start with a longer one begins no trace, with a log line.
+    static constexpr std::size_t longestTracingFileName = 4095;
+    // Of the trace that is running or prepared.
     [[nodiscard]] const std::optional<std::string>& tracingFileName() const { return tracingFileName_; }
     // Of the trace that is running or prepared; null without one.
     [[nodiscard]] const TraceRunner* traceRunner() const { return traceRunner_.get(); }

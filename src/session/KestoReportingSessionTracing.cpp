@@ -69,8 +69,15 @@ void KestoReportingSession::startTracing()
                   TraceRunner::mostAtOnce);
         return;
     }
-    KESTO_LOG(KestoReportingSessionCategory(), Debug, "Got the tracefile {}, setting up trace", file->text());
-    setupTracing(file->text());
+    const std::string path = file->text();
+    if (path.size() > longestTracingFileName) {
+        KESTO_LOG(KestoReportingSessionCategory(), Error,
+                  "session {} is not traced: the path of its parameters file has {} bytes; no more than {} are a path",
+                  reporterID_, path.size(), longestTracingFileName);
+        return;
+    }
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "Got the tracefile {}, setting up trace", path);
+    setupTracing(path);
     if (!tracingFileName_)
         return;
     startedTracing_ = true;
@@ -85,4 +92,5 @@ void KestoReportingSession::stopTracing()
     traceRunner_->stopTracingandProcessResults();
     traceRunner_.reset();
     traceParams_.reset();
+    tracingFileName_.reset();
 }

@@ -104,7 +104,7 @@ public:
         if (const auto traces = arrayAt(root, TraceParamChildrenNodes); !traces)
             fail(foundation::format("Failed to load Trace Parameter Array with error: {}", traces.error()));
         else
-            loadEach(*traces, [this](const Value& trace) { loadTrace(trace); });
+            loadTraces(*traces);
         if (params_->leftOut > 0)
             KESTO_LOG(KestoReportingTraceCategory(), Error,
                       "Left out {} traces and trace points: no more than {} are read", params_->leftOut,
@@ -152,6 +152,19 @@ private:
         }
     }
 
+    // One signpost trace decides for the whole file, so all are asked, also those that are left out.
+    void loadTraces(const Array& traces)
+    {
+        if (std::ranges::any_of(traces, isSignpostTrace))
+            params_->traceType = TraceParams::signpostTrace;
+        loadEach(traces, [this](const Value& trace) { loadTrace(trace); });
+    }
+
+    static bool isSignpostTrace(const Value& value)
+    {
+        return textAt(value.dictionary().value_or(Dictionary()), TraceDataType) == TraceDataTypeOSSignpost;
+    }
+
     void loadTrace(const Value& value)
     {
         const auto read = asDictionary(value);
@@ -164,8 +177,6 @@ private:
             if (params_->name.empty())
                 KESTO_LOG(KestoReportingTraceCategory(), Error, "Description not found in the plist file");
         }
-        if (textAt(trace, TraceDataType) == TraceDataTypeOSSignpost)
-            params_->traceType = TraceParams::signpostTrace; // and stays it
 
         if (const auto points = arrayAt(trace, TraceDataChildrenNodes); !points)
             fail(foundation::format("Failed to read the Trace Points from the plist file with error: {}",

@@ -226,6 +226,28 @@ TEST_F(SessionTracing, StartsWithoutIntervalsWhenTheFileCannotBeRead)
     EXPECT_THAT(platform.performanceWriter.files()[0]->measurements, IsEmpty());
 }
 
+TEST_F(SessionTracing, StartsWithAPathAsLongAsPathsMayBe)
+{
+    session->setConfiguration(Dictionary{{fileKey, std::string(4095, '/')}});
+    session->start();
+    EXPECT_TRUE(session->startedTracing());
+}
+
+TEST_F(SessionTracing, DoesNotStartWithATextThatIsTooLongForAPathWhichIsSaid)
+{
+    session->setConfiguration(Dictionary{{fileKey, std::string(4096, '/')}});
+    platform.log.clear();
+    session->start();
+    EXPECT_FALSE(session->startedTracing());
+    EXPECT_EQ(session->tracingFileName(), std::nullopt);
+    EXPECT_EQ(tracesStarted(), 0U);
+    EXPECT_THAT(lines(),
+                ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42"),
+                            IsLine(Error, "kerr",
+                                   "session 42 is not traced: the path of its parameters file has 4096 bytes; no more "
+                                   "than 4095 are a path")));
+}
+
 TEST_F(SessionTracing, IsNotStartedAnewByASecondStart)
 {
     session->start();
@@ -300,7 +322,7 @@ TEST_F(SessionTracing, WritesItsResultsWhenTheSessionStops)
     EXPECT_EQ(results.measurements[1].value, 7);
     EXPECT_TRUE(results.closed);
     EXPECT_EQ(TraceRunner::numberOfRunners(), 0U) << "nothing of it is left";
-    EXPECT_EQ(session->tracingFileName(), file);
+    EXPECT_EQ(session->tracingFileName(), std::nullopt);
 }
 
 TEST_F(SessionTracing, StopsBehindTheSummaryAndBeforeTheMessagesAreDropped)

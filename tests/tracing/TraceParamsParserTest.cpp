@@ -439,6 +439,18 @@ TEST_F(TraceParamsFile, LeavesOutTracesAndPointsBeyondTheMost)
     EXPECT_THAT(errors(), ElementsAre(Says(Error, "Left out 7 traces and trace points: no more than 1024 are read")));
 }
 
+TEST_F(TraceParamsFile, WithASignpostTraceBeyondTheMostIsOneAllTheSame)
+{
+    constexpr std::size_t most = TraceParamsParser::mostTracesAndPoints;
+    std::vector<Value> traces(most, trace("T", Array()));
+    EXPECT_EQ(read(file(Array(traces))).traceType, TraceParams::kernelTrace);
+    traces.emplace_back(trace("further", Array()).with("TraceType", "OSSignpost"));
+    traces.emplace_back("no trace");
+    const TraceParams params = read(file(Array(traces)));
+    EXPECT_EQ(params.traceType, TraceParams::signpostTrace);
+    EXPECT_EQ(params.leftOut, 2U);
+}
+
 // --- the record
 
 TEST(TraceDataParamsRecord, TakesTheEndCodeUnlessItIsAnImpulse)
