@@ -560,6 +560,14 @@ TEST_F(TracedStartTest, IsHeldWhenTheFlagIsOff)
     EXPECT_EQ(start(42), unanswered);
 }
 
+TEST_F(TracedStartTest, IsHeldOnASystemThatCannotTrace)
+{
+    platform.featureFlags.enable("Sonalis", "Tracing");
+    platform.kernelTrace.available = false;
+    makeTestSession(11);
+    EXPECT_EQ(start(42), unanswered);
+}
+
 // --- stop
 
 TEST_F(ClientTest, StopsASessionAndAnswersItsStart)
@@ -582,6 +590,21 @@ TEST_F(ClientTest, StopsASessionAndAnswersItsStart)
                             IsLine(Default, "kerc", "0 active reporting session(s) []"),
                             IsLine(Default, "kerc", "stopping 42")));
     EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStop, sessionStopping));
+}
+
+TEST_F(ClientTest, LetsGoOfTheDriversSnapshotBeforeItStopsASession)
+{
+    create(42);
+    start(42);
+    EXPECT_NE(player.session(42)->driverSnapShot(), std::nullopt);
+    std::vector<bool> snapShots;
+    platform.log.setObserver([&](const LogLine& line) {
+        if (line.message == "ending session 42")
+            snapShots.push_back(player.session(42)->driverSnapShot().has_value());
+    });
+    stop(42);
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(snapShots, ElementsAre(false, false));
 }
 
 TEST_F(ClientTest, AnswersTheStopOfASessionThatIsNotStarted)
@@ -805,6 +828,19 @@ TEST_F(ClientTest, StopsItsStartedSessionsInOrderAndLeavesWhenTheConnectionIsLos
                             IsLine(Default, "kerc", "removing 1001 from the server client list")));
     EXPECT_THAT(platform.traceMarkers.take(),
                 ElementsAre(sessionStopping, sessionStopping, sessionDestroyed, sessionDestroyed, sessionDestroyed));
+}
+
+TEST_F(ClientTest, SaysThatItIsRemovedOnceItIs)
+{
+    std::vector<std::size_t> clients;
+    platform.log.setObserver([&](const LogLine& line) {
+        if (line.message == "removing 1001 from the server client list")
+            clients.push_back(harness.service->getAllClients().size());
+    });
+    player.object()->handleConnectionError();
+    platform.workQueues.runAll();
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(clients, ElementsAre(1));
 }
 
 TEST_F(ClientTest, DoesNothingWhenItsConnectionIsLostAgain)

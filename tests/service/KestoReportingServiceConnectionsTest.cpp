@@ -291,6 +291,20 @@ TEST_F(ConnectionTest, ThatBreaksIsRemovedOnceAndItsSessionsAreStoppedOnce)
     EXPECT_THAT(uptimes(), SizeIs(1));
 }
 
+TEST_F(ConnectionTest, ThatBreaksIsSaidToBeforeItsClientHearsOfIt)
+{
+    const auto connection = connect();
+    std::vector<std::size_t> submitted;
+    platform.log.setObserver([&](const LogLine& line) {
+        EXPECT_EQ(line.message, "interruptionHandler: connection exited");
+        submitted.push_back(platform.workQueues.pending());
+    });
+    connection->interrupt();
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(submitted, ElementsAre(0));
+    EXPECT_EQ(platform.workQueues.pending(), 1U);
+}
+
 TEST_F(ConnectionTest, ThatIsInvalidatedLongAfterItBrokeFindsItsClientGone)
 {
     const auto connection = connect();

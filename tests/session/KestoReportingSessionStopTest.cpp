@@ -100,6 +100,22 @@ TEST_F(SessionStop, RecordsEachVolumeEventThenHandsItToTheBridgeThenWritesTheFil
                             "sending summary event for reporter 42", "recorded Undefined_Unknown_1"));
 }
 
+TEST_F(SessionStop, CountsAsStartedUntilItIsOver)
+{
+    play();
+    std::vector<bool> started;
+    platform.log.setObserver([&](const support::LogLine&) { started.push_back(session->started()); });
+    platform.analytics.setObserver([&](const std::string&) { started.push_back(session->started()); });
+    platform.traceMarkers.setObserver([&](std::uint32_t) { started.push_back(session->started()); });
+    session->stop();
+    platform.log.setObserver(nullptr);
+    platform.analytics.setObserver(nullptr);
+    platform.traceMarkers.setObserver(nullptr);
+    EXPECT_THAT(started, SizeIs(testing::Ge(12U)));
+    EXPECT_THAT(started, testing::Each(true));
+    EXPECT_FALSE(session->started());
+}
+
 TEST_F(SessionStop, SaysWhatItDoesAtItsLevel)
 {
     play();

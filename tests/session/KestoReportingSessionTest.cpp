@@ -362,6 +362,23 @@ TEST_F(SessionTest, BeginsARunWithAnEmptyStore)
     EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(started));
 }
 
+TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
+{
+    session->start();
+    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    session->stop();
+    std::optional<std::size_t> messages;
+    platform.traceMarkers.setObserver([&](std::uint32_t code) {
+        EXPECT_EQ(code, started);
+        EXPECT_TRUE(session->started());
+        if (const auto store = session->nestedAggregatedPayloadData())
+            messages = store->size();
+    });
+    session->start();
+    platform.traceMarkers.setObserver(nullptr);
+    EXPECT_EQ(messages, 0U);
+}
+
 TEST_F(SessionTest, StartedTwiceGoesOnAsItIs)
 {
     session->start();
@@ -391,6 +408,20 @@ TEST_F(SessionTest, EndsARunAndDropsWhatItRecorded)
     EXPECT_THAT(lines[0], IsLine(Debug, "kerr", "ending session 42"));
     EXPECT_THAT(lines[1], IsLine(Debug, "kerr", "ending session 42"));
     EXPECT_EQ(platform.traceMarkers.take().front(), stopping);
+}
+
+TEST_F(SessionTest, SaysTwiceThatItEndsBeforeItMarksIt)
+{
+    session->start();
+    std::vector<std::string> steps;
+    platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
+    platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
+    session->stop();
+    platform.log.setObserver(nullptr);
+    platform.traceMarkers.setObserver(nullptr);
+    ASSERT_THAT(steps, SizeIs(testing::Ge(3U)));
+    steps.resize(3);
+    EXPECT_THAT(steps, ElementsAre("ending session 42", "ending session 42", std::to_string(stopping)));
 }
 
 TEST_F(SessionTest, StoppedWithoutAStartOnlySaysSo)

@@ -61,6 +61,19 @@ TEST_F(RunnerResults, AreWrittenInTheOrderInWhichTheyWereMeasuredAndSummedUpInTh
     EXPECT_EQ(lines.back().file, "TraceRunnerResults.cpp");
 }
 
+TEST_F(RunnerResults, OfATraceAreSummedUpBeforeTheyAreWritten)
+{
+    std::vector<std::size_t> written;
+    platform.log.setObserver([&](const support::LogLine& line) {
+        if (line.message.starts_with("Writing out"))
+            written.push_back(file().measurements.size());
+    });
+    trace({5, 3, 9});
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(written, ElementsAre(0));
+    EXPECT_THAT(file().measurements, SizeIs(3));
+}
+
 // --- what is missing in them
 
 using Remarks = std::map<std::string, foundation::Value, std::less<>>;
