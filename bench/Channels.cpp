@@ -1,5 +1,5 @@
-// Driver statistics: a snapshot of a thousand channels beside reading the same files in one loop, putting their change
-// into words, and publishing values beside writing a file for each of them.
+// Driver statistics: a snapshot of a thousand channels compared with reading the same files in one loop, formatting
+// their changes, and publishing values compared with writing a file for each.
 #include "Groups.h"
 #include "driver/KestoReportingDriverUtility.h"
 #include "platform/linux/channels/ChannelDifference.h"
@@ -25,7 +25,7 @@ namespace fs = std::filesystem;
 
 constexpr std::size_t channelCount = 1000;
 
-// A directory that is gone at the end: where channels usually are, in memory, if that is there.
+// A temporary directory in the usual, in-memory place of channels, if that exists.
 class ChannelRoot {
 public:
     ChannelRoot()
@@ -55,7 +55,8 @@ void write(const fs::path& path, std::string_view text)
         throw std::runtime_error("a channel cannot be written");
 }
 
-// Half of them numbers, the others histograms of ten buckets and states, as they are after so many periods.
+// Half of the channels are numbers, the others histograms of ten buckets and states; the text is that after so many
+// periods.
 std::string textOfChannel(std::size_t channel, std::size_t periods)
 {
     if (channel % 2 == 0)
@@ -192,10 +193,10 @@ public:
         return nanosecondsEach(many, [&](std::size_t each) { state_.enter(each % 2); });
     }
 
-    // A thousand values a second, on ten channels in turns: what it costs the caller and what it costs the publisher's
-    // thread, but not that this program wakes up for each tick. All of it is processor time: by the clock, the caller
-    // would be charged for the publisher's work a second time whenever that thread takes its processor, and for
-    // everybody else's. And it is a whole second, in which the publisher writes as often each time.
+    // A thousand values a second, on ten channels in turns: the cost for the caller and for the publisher's thread,
+    // without this program's wake-ups for each tick. It measures processor time, because the wall clock would also
+    // count other threads that run on the caller's processor, and so count the publisher's work twice. It takes a whole
+    // second, so that the publisher writes equally often in each round.
     double costOfSecond()
     {
         constexpr int ticks = 100;
@@ -214,7 +215,7 @@ public:
         return (adding + writing) / (ticks * static_cast<double>(channels_.size()));
     }
 
-    // What a program would do that writes a file itself whenever a value changes.
+    // The work of a program that writes a file itself whenever a value changes.
     double costOfWriting()
     {
         constexpr std::size_t few = 500;

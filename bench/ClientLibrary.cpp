@@ -1,6 +1,5 @@
-// What sending costs the thread that calls libkesto, which may be a real-time thread: time, and system calls, which
-// there must not be any of. The peer is what a program would do without the library: writing as many bytes to a
-// socket itself.
+// The cost of sending for the thread that calls libkesto, which may be a real-time thread: time, and system calls, of
+// which there must be none. The peer is a program without the library, which writes as many bytes to a socket.
 #include "Groups.h"
 #include "support/SampleMessage.h"
 #include "support/ServiceProcess.h"
@@ -22,7 +21,7 @@
 namespace bench {
 namespace {
 
-constexpr std::size_t burst = 256; // messages that the client's queue takes at once
+constexpr std::size_t burst = 256; // messages that fit in the client's queue
 constexpr std::size_t bursts = 100;
 
 void check(kesto::Status status)
@@ -89,7 +88,7 @@ void countSystemCall(int, siginfo_t*, void*)
     systemCalls = systemCalls + 1;
 }
 
-// From now on each system call of this thread is refused and counted, but for the one that ends the thread.
+// From now on each system call of this thread is refused and counted, except the one that ends the thread.
 void trapSystemCalls()
 {
     struct sigaction action = {};
@@ -114,7 +113,7 @@ template <typename Send> double systemCallsOf(Send send)
     systemCalls = 0;
     std::thread([&send] {
         trapSystemCalls();
-        ::syscall(SYS_getppid); // so that counting is seen to work
+        ::syscall(SYS_getppid); // to check that counting works
         for (std::size_t each = 0; each < burst; ++each)
             send();
         ::syscall(SYS_exit, 0); // not by returning: that needs other system calls

@@ -1,5 +1,5 @@
-// The two steps of a message's road that are worth setting beside something by themselves: CBOR to values beside
-// libcbor, and keeping a payload beside a list of byte strings.
+// Two steps of a message's path that have peers of their own: decoding CBOR compared with libcbor, and keeping a
+// payload compared with a list of byte strings.
 #include "Groups.h"
 #include "foundation/cbor/Cbor.h"
 #include "session/KestoReportingMessageStore.h"
@@ -38,7 +38,7 @@ double costOfDecoder(const std::string& encoded)
     });
 }
 
-// Looks at every item and builds nothing.
+// Visits every item without building values.
 double costOfStreaming(const std::string& encoded)
 {
     return nanosecondsEach(decodedEach, [&](std::size_t) {

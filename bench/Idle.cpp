@@ -1,5 +1,5 @@
-// What the service costs when its clients have nothing to say. All rounds run side by side: they disturb each other
-// as little as they disturb anybody else.
+// The cost of the service while its clients are silent. All rounds run at the same time, because idle services do not
+// disturb each other.
 #include "Groups.h"
 #include "peers/DaemonPeer.h"
 #include "support/ServiceProcess.h"

@@ -1,5 +1,5 @@
-// What a log statement costs that is not to be logged: one of the service's own, whose arguments would be dear to
-// make, beside syslog below its mask.
+// The cost of a disabled log statement: one of the service's own, with expensive arguments, compared with syslog below
+// its mask.
 #include "Groups.h"
 #include "support/InProcessPlatform.h"
 #include "utility/KestoReportingLogCategories.h"

@@ -1,6 +1,5 @@
-// How long other clients wait while the end of a session with a million messages is being worked on. The server queue
-// does one thing at a time, so they wait for as long as that takes; what the row shows is that it is once, and not
-// more.
+// How long other clients wait while a session with a million messages ends. The server queue runs one item at a time,
+// so they wait for that item; the row shows that they wait for it only once.
 #include "Groups.h"
 #include "support/ServiceProcess.h"
 

@@ -1,7 +1,7 @@
-// Finding a session among those of all clients, in a service with ten thousand of them and in one with a single one.
+// Finding a session among those of all clients, in a service with ten thousand clients and in one with a single client.
 //
-// Found again and again, as the sessions of a client that is sending are; after a pause in which the processor's caches
-// were used for something else; and all of them in no order, which is as much as memory can be made to do.
+// Three cases: the same sessions again and again, as for a sending client; after a pause in which other data filled the
+// processor's caches; and all sessions in random order, the worst case for memory.
 #include "Groups.h"
 #include "support/CrowdedService.h"
 #include "support/InProcessPlatform.h"
@@ -19,7 +19,7 @@ constexpr auto sessionsEach = CrowdedService::sessionsEach;
 
 using ReporterIDs = std::vector<std::int64_t>;
 
-// The sessions of a client, so many times.
+// The sessions of a client, repeated so many times.
 ReporterIDs sessionsOf(std::int64_t client, std::size_t times)
 {
     ReporterIDs reporterIDs;
@@ -38,13 +38,13 @@ void displaceCaches()
         ++memory[at];
 }
 
-// Nanoseconds to find one of these.
+// Nanoseconds to find one of these sessions.
 double costOf(CrowdedService& service, std::span<const std::int64_t> reporterIDs)
 {
     return nanosecondsEach(reporterIDs.size(), [&](std::size_t each) { service.find(reporterIDs[each]); });
 }
 
-// What finding a client's sessions costs after a pause, for clients chosen at random among so many.
+// The cost of finding a client's sessions after a pause, for clients chosen at random among so many.
 double costAfterPause(CrowdedService& service, std::int64_t clients)
 {
     constexpr int pauses = 200;

@@ -1,4 +1,4 @@
-// A device-wide setting changes: every session of every client is told.
+// A device-wide setting changes, and every session of every client gets it.
 #include "Groups.h"
 #include "support/CrowdedService.h"
 #include "support/InProcessPlatform.h"
@@ -18,7 +18,7 @@ void measureNotification(const Options& options, Report& report)
     const std::string what =
         fmt::format("a notification to {} clients of {} sessions", clients, CrowdedService::sessionsEach);
     const auto times = compete(options, what, [&] {
-        state ^= 1; // so that no session drops it as a repeat
+        state ^= 1; // so that sessions do not drop it as a repetition
         return nanosecondsEach(1, [&](std::size_t) { platform.post(ringerSwitch, state); }) / 1e6;
     });
     report.add({what, "ms", times[0], {}, Target::figureAtMost(20)});

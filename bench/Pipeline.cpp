@@ -1,5 +1,4 @@
-// How many messages a second one client gets answered that does not wait for one answer before it sends the next
-// message.
+// How many messages a second the service answers for one client that sends without waiting for answers.
 #include "Groups.h"
 #include "peers/BusPeer.h"
 #include "support/ServiceProcess.h"
@@ -7,7 +6,7 @@
 namespace bench {
 namespace {
 
-// Messages a second, of so many after a few that do not count.
+// Messages a second, measured over so many after a few warm-up messages.
 template <typename Client> double rateOf(Client& client, std::size_t count)
 {
     client.pipeline(RawClient::mostUnanswered);

@@ -1,5 +1,5 @@
-// The diagnostics record to bytes and back, beside the class that protoc generates for the same record. Each side uses
-// its record and its bytes again and again, as whoever has many of them does.
+// Encoding and decoding the diagnostics record, compared with the class that protoc generates for the same record. Each
+// side reuses its record and its bytes, as a program with many records does.
 #include "AudioIssueDetected.pb.h"
 #include "Groups.h"
 #include "sinks/AudioIssueDetected.h"

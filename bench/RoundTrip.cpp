@@ -1,8 +1,8 @@
-// How long a client waits for the answer to a message. The floor is a process that reads as many bytes and writes
-// as many back, and does nothing else.
+// How long a client waits for the answer to a message. The lower bound is a process that only reads and writes as many
+// bytes.
 //
-// On most machines the greater part of the time is that of processors waking from their sleep, in which all contestants
-// are equal; so all is measured a second time on one processor, where that falls away.
+// On most machines processors spend most of the time waking up, which is equal for all contestants; so everything is
+// measured a second time on one processor, which does not sleep.
 #include "Groups.h"
 #include "peers/BusPeer.h"
 #include "support/ServiceProcess.h"

@@ -1,4 +1,4 @@
-// What recording costs a session in time, as it grows, and in memory.
+// The cost of recording in a growing session, in time and memory.
 #include "Groups.h"
 #include "foundation/cbor/Cbor.h"
 #include "session/KestoReportingSession.h"
@@ -15,7 +15,7 @@ constexpr std::uint32_t windowSize = 1000;
 constexpr std::uint32_t early = 1'000;
 constexpr std::uint32_t late = 1'000'000;
 
-// What malloc has given out.
+// The bytes that malloc has allocated.
 double allocatedBytes()
 {
     const auto info = ::mallinfo2();
@@ -33,7 +33,7 @@ public:
             send(message());
     }
 
-    // Nanoseconds a message, of those around the `place`th.
+    // Nanoseconds for each of the messages around the `place`th.
     double costAround(std::uint32_t place)
     {
         growTo(place - windowSize / 2);

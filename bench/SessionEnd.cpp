@@ -1,5 +1,5 @@
-// What the end of a long session costs: finding what was played, the file, the summary event, and the memory that all
-// of it takes.
+// The cost of a long session's end: computing the playing times, the file, the summary event, and the memory of all of
+// these.
 #include "Groups.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "session/KestoReportingSession.h"
@@ -20,8 +20,8 @@ namespace {
 
 constexpr std::uint32_t messageCount = 1'000'000;
 
-// A player that runs for days: it says something eight times a second, is paused now and then, and its volume is
-// changed while it plays. As many entries as the sample message has; spatial audio is rarely switched.
+// A player that runs for days: it sends eight messages a second, is paused now and then, and its volume changes while
+// it plays. The message has as many entries as the sample message; spatial audio is rarely switched.
 foundation::Dictionary playerMessage(std::uint32_t number)
 {
     constexpr std::uint32_t pause = 2000;
@@ -60,8 +60,8 @@ std::size_t textSize(const foundation::Dictionary& summary)
     return size;
 }
 
-// All work begins with memory fresh from the system, as it does when a service has a long session end: whoever found
-// what the round before left behind would be spared the first touch of every page.
+// Each round begins with memory fresh from the system, as when a long session ends in a service: memory of an earlier
+// round would save the first touch of every page.
 template <typename Work> Contestant millisecondsOf(Work work)
 {
     return [work] {
@@ -190,7 +190,7 @@ void measureEvent(const Options& options, Report& report, const KestoReportingSe
                 Peer{"copy of its text", times[1]}, Target::ratioAtMost(3)});
 }
 
-// Of this process, in megabytes: "VmRSS", or "VmHWM" for the most since `forgetMostMemory`.
+// Memory of this process, in megabytes: "VmRSS", or "VmHWM" for the maximum since `forgetMostMemory`.
 double memory(std::string_view what)
 {
     std::ifstream status("/proc/self/status");

@@ -1,5 +1,5 @@
-// How long it takes from starting the process until a client has its first answer: in an empty state directory, as
-// after installation.
+// The time from the start of the process until a client has its first answer, in an empty state directory, as after
+// installation.
 #include "Groups.h"
 #include "peers/DaemonPeer.h"
 #include "support/ServiceProcess.h"

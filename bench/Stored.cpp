@@ -1,6 +1,6 @@
-// How many messages a second become stored events: the service answers when both events of a message are committed,
-// journald is done when the last of its messages can be read back. In a burst, and for as long as it takes both to move
-// what they have written to its place; either may keep 4 GB.
+// How many messages a second become stored events: the service answers when both events of a message are committed; for
+// journald the time ends when its last message can be read back. Measured in a burst, and so long that both move their
+// written data to its final place; each may keep 4 GB.
 #include "Groups.h"
 #include "peers/JournalPeer.h"
 #include "support/ServiceProcess.h"

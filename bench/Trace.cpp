@@ -1,4 +1,4 @@
-// What a trace costs once it has ended: pairing its events, and everything from its stop to the results file.
+// The cost of a trace after its end: pairing its events, and everything from its stop to the results file.
 #include "Groups.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"

@@ -1,6 +1,6 @@
-// The kernel's trace: what an event costs whoever emits it, and how fast the service takes the kernel's pages apart and
-// puts the events of all processors in order. Emitting is measured on the kernel itself; the peer is the bare write of
-// as many bytes.
+// The kernel's trace: the cost of an event for its emitter, and how fast the service reads the kernel's pages and
+// orders the events of all processors. Emitting is measured with the real kernel; the peer is a bare write of as many
+// bytes.
 #include "Groups.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
 #include "platform/linux/trace/TraceMarker.h"
@@ -32,7 +32,7 @@ constexpr std::uint32_t code = 0x21040010;
 constexpr std::uint16_t markerType = 19;
 constexpr std::uint64_t firstTime = 1'000'000;
 
-// A page of the kernel's, full of events that are so far apart.
+// A full page of the kernel, with events at that distance in time.
 std::vector<std::byte> pageOf(std::uint64_t time, std::uint32_t distance, std::size_t& events)
 {
     constexpr std::size_t pageSize = 4096;
@@ -60,7 +60,7 @@ double mergingRate(std::uint32_t processors)
 {
     constexpr std::size_t pagesEach = 100; // of a processor, in one reading
     constexpr std::size_t readings = 20;
-    constexpr std::uint64_t span = 78 * 200; // the time of a page, not less than its events take
+    constexpr std::uint64_t span = 78 * 200; // the time of a page, at least that of its events
     std::vector<std::vector<std::byte>> pages;
     std::size_t events = 0;
     for (std::size_t page = 0; page < pagesEach * readings; ++page)
@@ -95,7 +95,7 @@ void measureMerging(const Options& options, Report& report)
     add("8 processors", rates[2]);
 }
 
-// A service as far as a client that emits is concerned: it hands out the marker, over a socket of its own.
+// A minimal service for a client that emits: it sends the marker over a socket of its own.
 class HandingService final : public platform::ConnectionListenerDelegate {
 public:
     explicit HandingService(platform::TraceMarkerAccess& access)
@@ -136,19 +136,19 @@ private:
     std::thread thread_;
 };
 
-// All that emits, on a marker.
+// All emitters, on one marker.
 class Emitting {
 public:
     explicit Emitting(int marker) : marker_(marker)
     {
         if (access_.open(marker))
-            throw std::runtime_error("there is no page");
+            throw std::runtime_error("the page is missing");
         access_.setTracing(true);
         kesto::Options options;
         options.socketPath = service_.path();
         options.trace = true;
         if (client_.open(options) != kesto::Status::Ok)
-            throw std::runtime_error("there is no client");
+            throw std::runtime_error("the client cannot be made");
         constexpr std::chrono::seconds patience(10);
         for (const auto start = Clock::now(); !kesto::Tracer(client_).isActive(); std::this_thread::yield())
             if (Clock::now() - start > patience)
@@ -193,13 +193,13 @@ void measureSilence(const Options& options, Report& report)
     const platform::FileDescriptor nothing(::open("/dev/null", O_WRONLY | O_CLOEXEC));
     Emitting emitting(nothing.get());
     const auto costs = compete(
-        options, "emitting while nobody traces", [&] { return emitting.costOfClient(count); },
+        options, "emitting while no trace runs", [&] { return emitting.costOfClient(count); },
         [&] { return emitting.costOfService(count); });
-    report.add({"an event while nobody traces, a client's", "ns", costs[0], {}, Target::figureAtMost(2)});
-    report.add({"an event while nobody traces, the service's", "ns", costs[1], {}, Target::figureAtMost(2)});
+    report.add({"an event while no trace runs, a client's", "ns", costs[0], {}, Target::figureAtMost(2)});
+    report.add({"an event while no trace runs, the service's", "ns", costs[1], {}, Target::figureAtMost(2)});
 }
 
-constexpr std::string_view emitting = "an event while somebody traces";
+constexpr std::string_view emitting = "an event while a trace runs";
 
 void measureEmittingOn(const std::filesystem::path& tracefs, const std::string& name, const Options& options,
                        Report& report)

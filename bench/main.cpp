@@ -1,5 +1,5 @@
-// kesto_bench: measures the service and its library, each figure beside that of a peer in the same run, and prints
-// a table. It is a measurement and no test: a target that is missed is said, and the exit status is still 0.
+// kesto_bench: measures the service and its library, each figure with that of a peer in the same run, and prints a
+// table. It is not a test: it reports a missed target, and the exit status is still 0.
 #include "Groups.h"
 
 #include "foundation/values/Json.h"
@@ -56,7 +56,7 @@ void printHelp()
         fmt::print("  {:<12} {}\n", group.name, group.what);
 }
 
-// Nothing when the program is done already, or cannot go on: then with that exit status.
+// Nothing if the program must end now; `exitStatus` is then its exit status.
 std::optional<Options> parse(int argumentCount, char** arguments, int& status)
 {
     constexpr std::array<option, 6> known{{{"filter", required_argument, nullptr, 'f'},

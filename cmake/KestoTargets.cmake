@@ -1,5 +1,5 @@
-# What every target of the project has in common: the language, the warnings, the sanitizers, and two
-# functions so that a folder's CMakeLists.txt names only its files and its neighbours.
+# The common settings of all targets: the language, the warnings, the sanitizers, and two functions so that a folder's
+# CMakeLists.txt names only its files and its neighbours.
 
 set(CMAKE_CXX_STANDARD 23)
 set(CMAKE_CXX_STANDARD_REQUIRED ON)
@@ -8,7 +8,7 @@ set(CMAKE_C_STANDARD 11)
 set(CMAKE_EXPORT_COMPILE_COMMANDS ON)
 set(CMAKE_POSITION_INDEPENDENT_CODE ON)
 
-# ccache hashes a precompiled header's bytes; only with these settings does it keep what was made with one.
+# ccache hashes a precompiled header's bytes; only with these settings does it cache objects that use one.
 find_program(KESTO_CCACHE ccache)
 if(KESTO_CCACHE)
   set(overlooked CCACHE_SLOPPINESS=pch_defines,time_macros,include_file_mtime,include_file_ctime)
@@ -16,22 +16,22 @@ if(KESTO_CCACHE)
   set(CMAKE_C_COMPILER_LAUNCHER ${CMAKE_CXX_COMPILER_LAUNCHER})
 endif()
 
-# In debug builds the standard library asserts, too, what it expects of its callers: an index within bounds, for one.
+# In debug builds the standard library checks its callers, too, such as an index within bounds.
 add_compile_definitions($<$<CONFIG:Debug>:_GLIBCXX_ASSERTIONS>)
 
-# Locks are annotated; clang proves that what they guard is only touched while they are held.
-# g++'s own <algorithm> uses what it calls deprecated, which only clang says; what we use of it g++ says too.
+# Locks are annotated; clang proves that guarded data is used only while the lock is held. g++'s own <algorithm> uses
+# deprecated functions, for which only clang warns; g++ itself warns of the project's uses.
 add_compile_options(-Wall -Wextra -Wpedantic -Werror -Wshadow -Wimplicit-fallthrough
                     $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
                     $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety> $<$<CXX_COMPILER_ID:Clang>:-Wno-deprecated-declarations>)
 
-# A program needs only the libraries that it uses, of those that its layers use.
+# A program is linked only with those libraries of its layers that it uses.
 add_link_options(-Wl,--as-needed)
 
 # By default g++ collects garbage, often for little: without it compiling takes 7 % less time and at most 1 GiB.
 add_compile_options($<$<CXX_COMPILER_ID:GNU>:--param=ggc-min-heapsize=1000000>)
 
-# A sanitizer's report names functions and lines; it shows no variables, so that these need not be described.
+# A sanitizer's report names functions and lines but no variables, so debug information leaves out variables.
 if(KESTO_SANITIZE)
   add_compile_options(-fsanitize=${KESTO_SANITIZE} -fno-sanitize-recover=all -fno-omit-frame-pointer -g1
     $<$<CXX_COMPILER_ID:Clang>:-fsanitize-ignorelist=${PROJECT_SOURCE_DIR}/cmake/sanitizers-ignorelist.txt>)
@@ -67,8 +67,8 @@ function(kesto_layer name)
   target_link_libraries(kesto_${name} PUBLIC ${arg_USES} PRIVATE ${arg_PRIVATE_USES})
 endfunction()
 
-# kesto_test_headers: the headers of the test libraries, compiled once for all test programs. A precompiled header serves
-# only what is compiled with the same options, so these are public: position-independent, with the same macros.
+# kesto_test_headers: the headers of the test libraries, compiled once for all test programs. A precompiled header only
+# fits sources with the same options, so these are public: position-independent, with the same macros.
 function(kesto_make_test_headers)
   file(CONFIGURE OUTPUT test_headers.cpp CONTENT "// A target needs a source: this one has only headers.\n")
   add_library(kesto_test_headers STATIC ${CMAKE_CURRENT_BINARY_DIR}/test_headers.cpp)

@@ -1,6 +1,5 @@
-// The CBOR decoder reads what any process on the machine may send. Whatever the bytes, it must end with a value
-// or an error, whatever it read before; and a value that it gave must survive its own encoding, byte for byte the
-// second time.
+// Any process on the machine may send bytes to the CBOR decoder. For all bytes, and after all earlier frames, it must
+// end with a value or an error; and a decoded value must survive its own encoding, byte for byte the second time.
 #include "foundation/cbor/Cbor.h"
 
 #include <cstdint>
@@ -39,6 +38,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     require(again.has_value());
     require(encoded == encodedOf(*again));
 
-    static_cast<void>(decoded->text()); // what a log line or the store would write of it
+    static_cast<void>(decoded->text()); // as a log line or the store would write it
     return 0;
 }

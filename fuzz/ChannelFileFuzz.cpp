@@ -1,8 +1,8 @@
-// The file of a channel is written by any program that may publish. Whatever is in it, reading it ends with a channel
-// or an error; a channel has no more than its kind allows; nothing has changed between it and itself; and between
-// nothing and it, what has changed is all of it.
+// Any program that may publish writes channel files. For all bytes, reading ends with a channel or an error; a channel
+// holds only what its kind allows; its difference from itself is empty; and its difference from nothing is the whole
+// channel.
 //
-// So is whom it names as its owner.
+// The owner's line is foreign, too.
 //
 // The input is two files, one behind the other, cut in the middle by a zero byte, so that counters of two samples meet.
 #include "foundation/values/String.h"
@@ -55,7 +55,7 @@ ReportingChannel difference(const platform::ReportingSample& from, const Reporti
     return sample.channels[0];
 }
 
-// As the service does.
+// Reads as the service does.
 auto read(std::string_view text)
 {
     const std::size_t size = text.size();

@@ -1,6 +1,6 @@
-// What a client writes to its connection, cut as the socket may cut it. However the stream is cut, the same frames
-// must come of it, up to the same error; no more may be held than came; and decoding what the frames hold must
-// end, with the decoder of one connection remembering from one frame to the next.
+// A client's bytes, in pieces as the socket may deliver them. For all cuts the reader must yield the same frames, up to
+// the same error; it must not hold more than it got; and decoding the frames must end, with one decoder that keeps its
+// state from frame to frame.
 //
 // The first byte of the input chooses the cuts, the rest is the stream.
 #include "foundation/cbor/Cbor.h"
@@ -30,7 +30,7 @@ struct Outcome {
     friend bool operator==(const Outcome&, const Outcome&) = default;
 };
 
-// Takes the frames that are whole; false after an error.
+// Takes the complete frames; false after an error.
 bool takeFrames(FrameReader& reader, std::vector<std::string>& frames)
 {
     while (true) {

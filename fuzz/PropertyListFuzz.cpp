@@ -1,5 +1,5 @@
-// Property lists are read from files that any client may name. Whatever the bytes, reading must end with a failure in
-// words or with a value within the limits; and that value must be one like any other, which survives its encoding.
+// Property lists come from files that any client may name. For all bytes, reading must end with a failure and its text
+// or with a value within the limits; and that value must survive its encoding like any other.
 #include "foundation/cbor/Cbor.h"
 #include "foundation/plist/PropertyList.h"
 
@@ -48,7 +48,7 @@ void measure(const Value& value, unsigned depth, Measure& all)
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
 {
-    // Small, so that inputs of a fuzzer's size meet them.
+    // Small, so that inputs of a fuzzer's size reach them.
     constexpr foundation::PropertyListLimits limits{.bytes = 65536, .depth = 16, .objects = 1024, .content = 8192};
     const std::string_view bytes(reinterpret_cast<const char*>(data), size);
     const auto read = foundation::readPropertyList(bytes, limits);
@@ -59,8 +59,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     Measure all;
     measure(*read, 0, all);
     require(size <= limits.bytes && all.objects <= limits.objects && all.depth <= limits.depth);
-    // The key that a UID is given stands in no file. Text in XML is bounded by the file, whose two bytes of UTF-16 may
-    // become three.
+    // The key of a UID's dictionary is not in the file. The file bounds text in XML; two bytes of UTF-16 may become
+    // three.
     constexpr std::size_t uidKey = std::string_view("CF$UID").size();
     require(all.content <= std::max(limits.content + all.objects * uidKey, size + size / 2));
 
@@ -73,6 +73,6 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     foundation::appendCbor(*decoded, reencoded);
     require(encoded == reencoded); // stronger than equality of the values, which NaN never has
 
-    static_cast<void>(read->text()); // what a log line would write of it
+    static_cast<void>(read->text()); // as a log line would write it
     return 0;
 }

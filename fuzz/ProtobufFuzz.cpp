@@ -1,6 +1,6 @@
-// Bytes in the wire format of protocol buffers, from wherever. Reading must end, hand out nothing that lies outside the
-// input, and pass a group only whose content is well-formed by itself; and a record that was read must be written and
-// read again as the same.
+// Foreign bytes in the wire format of protocol buffers. Reading must end, return nothing from outside the input, and
+// accept a group only if its content is well-formed by itself; and a record that was read must stay the same when it is
+// written and read again.
 #include "foundation/protobuf/ProtobufReader.h"
 #include "sinks/AudioIssueDetected.h"
 
@@ -19,7 +19,7 @@ void require(bool holds)
         std::abort();
 }
 
-// All fields, and those inside of groups. Whether they are well-formed.
+// Reads all fields, and those inside groups. Returns whether they are well-formed.
 bool readFields(std::string_view bytes)
 {
     ProtobufReader reader(bytes);

@@ -1,6 +1,6 @@
-// What stands in a frame, as a call: whatever a client sends, either one operation is called and its answers go back
-// under the call's number, or the call is refused, and then nothing was called and nothing is answered. Nobody holds
-// the caller's connection afterwards.
+// The content of a frame, as a call: for all bytes, either the adapter calls one operation and its answers go back
+// under the call's number, or it refuses the call, calls no operation and sends no answer. Afterwards no code holds the
+// caller's connection.
 //
 // Which of the two it is, the table of the operations tells.
 //
@@ -31,7 +31,7 @@ void require(bool holds)
         std::abort();
 }
 
-// Answers every operation at once, with one that may be answered so; killing is never answered.
+// Answers every operation at once, except killing, which is never answered.
 class AnsweringProtocol final : public KestoReportingServiceProtocol {
 public:
     void createReportingSession(std::int64_t, SuccessReply reply) override { answer(reply, true); }

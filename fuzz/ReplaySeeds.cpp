@@ -1,5 +1,5 @@
-// Feeds a fuzz target with the files of a folder, where no fuzzer drives it: the seeds, which hold every input
-// that once broke it, are a test like any other.
+// Runs a fuzz target on the files of a folder, without a fuzzer: the seeds, which hold every input that once broke it,
+// are a test like any other.
 #include <cstdint>
 #include <cstdio>
 #include <filesystem>

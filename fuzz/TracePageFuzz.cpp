@@ -1,8 +1,8 @@
-// What is in a page of the kernel's trace is, but for the heads of its records, written by clients. Whatever stands in
-// one, its records lie inside it, one behind the other; and of pages of several processors come events of our own
-// alone, in the order of time, up to the moment that was asked for and none of them twice.
+// Clients write the content of a page of the kernel's trace, except the heads of its records. For all bytes, its
+// records lie inside it, one behind the other; and pages of several processors yield only the service's own events, in
+// the order of time, up to the requested moment, and each once.
 //
-// The input is pages, cut where a byte of the first one says; each is a copy of its own, so that reading beyond one is
+// The input is pages, cut where a byte of the first one says; each is a copy, so that reading beyond its end is
 // noticed.
 #include "platform/linux/trace/TraceMerger.h"
 

@@ -1,5 +1,5 @@
-// Both ends as sd-bus makes them, and what a raw client needs to stand in for one: the bytes of a call, taken off the
-// wire, and how long an answer is.
+// A server and a client with sd-bus, and the data with which a raw client can replace the latter: the bytes of a call,
+// read off the wire, and the length of an answer.
 #include "peers/BusPeer.h"
 
 #include "support/SampleMessage.h"
@@ -160,14 +160,14 @@ void BusClient::pipeline(std::size_t count)
 
 namespace {
 
-// What sd-bus sends for a call, taken from the other end of a socket.
+// The bytes that sd-bus sends for a call, read at the other end of a socket.
 std::string encodedCall()
 {
     const SocketPair sockets;
     const Bus bus = makeBus(::dup(sockets.client.get()));
     check(::sd_bus_start(bus.get()));
     writeAll(sockets.server.get(), fmt::format("DATA\r\nOK {:032x}\r\nAGREE_UNIX_FD\r\n", 1));
-    std::uint64_t cookie = 0; // by asking for it an answer is asked for
+    std::uint64_t cookie = 0; // requesting it requests an answer
     check(::sd_bus_send(bus.get(), sampleCall(bus.get(), numberMark).get(), &cookie));
     check(::sd_bus_flush(bus.get()));
     std::array<char, 4096> bytes{};

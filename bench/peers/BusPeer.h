@@ -1,5 +1,5 @@
-// The peer that comes closest: the same call over sd-bus, peer to peer, the message as a{sv}, then category, type and
-// the array of reporters. Its server unpacks all of it, as a service must, and answers.
+// The closest peer: the same call over sd-bus, peer to peer, the message as a{sv}, then category, type and the array of
+// reporters. Its server unpacks the whole call, as a service must, and answers.
 #pragma once
 
 #include "support/ChildProcess.h"
@@ -35,7 +35,7 @@ private:
 // The raw client, with a request that sd-bus encoded.
 [[nodiscard]] RawClient makeRawBusClient(platform::FileDescriptor socket);
 
-// Connects to a message bus that listens at the path, as one of its clients; null when nobody answers.
+// Connects to a message bus that listens at the path, as one of its clients; null if it does not answer.
 [[nodiscard]] Bus connectToBus(const std::filesystem::path& path);
 
 } // namespace bench

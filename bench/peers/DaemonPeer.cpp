@@ -1,4 +1,4 @@
-// It is there when its socket answers: nothing it says is waited for.
+// The daemon counts as running when its socket answers; its output is not read.
 #include "peers/DaemonPeer.h"
 
 #include "support/Harness.h"

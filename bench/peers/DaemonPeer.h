@@ -1,4 +1,4 @@
-// dbus-daemon as a peer for what a service costs when nothing happens, and for how quickly it is there.
+// dbus-daemon as a peer for the cost of an idle service and for the time to start.
 #pragma once
 
 #include "peers/BusPeer.h"

@@ -1,5 +1,5 @@
-// Whoever enters a namespace stays in it, so journald and whoever measures it live in a child, and a socket carries
-// requests and figures across.
+// A process cannot leave a namespace, so journald and the measuring code run in a child, and a socket carries requests
+// and figures.
 #include "peers/JournalPeer.h"
 
 #include "support/Harness.h"
@@ -43,7 +43,7 @@ void writeFile(const fs::path& path, std::string_view text)
     check(static_cast<bool>(file.flush()), path.native());
 }
 
-// Who is not root becomes it in a user namespace.
+// A process without root privileges gets them in a user namespace.
 void enterNamespace()
 {
     const auto user = ::getuid();
@@ -65,7 +65,7 @@ void bringJournaldHome(const fs::path& directory)
     fs::create_directories("/run/systemd/journal");
     fs::create_directories("/run/systemd/journald.conf.d");
     writeFile("/run/systemd/journald.conf.d/bench.conf", configuration);
-    writeFile("/run/systemd/journal/flushed", ""); // straight to the disk, as after the system's start
+    writeFile("/run/systemd/journal/flushed", ""); // writes to the disk at once, as after the system's start
 }
 
 template <typename Condition> void waitUntil(Condition condition, std::string_view what)
@@ -136,7 +136,7 @@ public:
 private:
     static iovec field(std::string_view text) { return {const_cast<char*>(text.data()), text.size()}; }
 
-    // Of the message at the place of reading; 0 when it is none of ours.
+    // The number of the message at the reading position; 0 for a foreign message.
     std::uint32_t numberHere()
     {
         constexpr std::string_view name = "FRAMES_RENDERED";
@@ -153,7 +153,7 @@ private:
 
 struct Answer {
     double rate = 0;
-    std::array<char, 256> problem{}; // empty when there is none
+    std::array<char, 256> problem{}; // empty on success
 
     static Answer about(std::string_view problem)
     {
@@ -181,7 +181,7 @@ void answer(int channel, const Answer& answer)
     writeAll(channel, {reinterpret_cast<const char*>(&answer), sizeof answer});
 }
 
-// Says when it is ready, then measures as often as it is asked to.
+// Reports when it is ready, then measures on each request.
 void serve(int channel, const fs::path& directory)
 {
     enterNamespace();
@@ -201,7 +201,7 @@ void serve(int channel, const fs::path& directory)
 
 // --- Here
 
-// Throws what went wrong in the namespace.
+// Throws the error that happened in the namespace.
 double readAnswer(int channel)
 {
     Answer answer;
@@ -217,7 +217,7 @@ double readAnswer(int channel)
 std::expected<std::unique_ptr<JournalPeer>, std::string> JournalPeer::start()
 {
     if (!fs::exists(program))
-        return std::unexpected(fmt::format("there is no {}", program));
+        return std::unexpected(fmt::format("{} is not installed", program));
     std::unique_ptr<JournalPeer> peer(new JournalPeer);
     peer->process_ = ChildProcess::run([&] {
         peer->channel_.client = {};

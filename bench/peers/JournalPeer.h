@@ -1,5 +1,5 @@
-// journald as a peer: a real one of its own, in a mount namespace where it finds its sockets and its journal in
-// private directories, with rate limits off. The machine's own journal is left alone.
+// journald as a peer: a real, private instance in a mount namespace, in which its sockets and its journal are in
+// private directories, with rate limits off. The machine's own journal is not touched.
 #pragma once
 
 #include "support/ChildProcess.h"
@@ -14,11 +14,11 @@ namespace bench {
 
 class JournalPeer {
 public:
-    // Or why it cannot be run on this machine.
+    // Starts it; the error gives the reason if it cannot run on this machine.
     [[nodiscard]] static std::expected<std::unique_ptr<JournalPeer>, std::string> start();
 
-    // Sends so many messages with the fields of the sample by sd_journal_sendv. How many journald took a second, until
-    // the last of them could be read from the journal, and all were there.
+    // Sends so many messages with the fields of the sample by sd_journal_sendv. Returns journald's messages a second,
+    // up to the moment at which the last can be read; checks that none is missing.
     [[nodiscard]] double rate(std::size_t count);
 
 private:

@@ -1,4 +1,4 @@
-// A child dies with its parent, by the kernel's word; what it cost stands in /proc.
+// The kernel kills a child with its parent; /proc holds its costs.
 #include "support/ChildProcess.h"
 
 #include <algorithm>

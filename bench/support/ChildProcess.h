@@ -1,5 +1,4 @@
-// Processes that a measurement needs beside its own: a service, a peer. They end with the object, and at the
-// latest with the program.
+// Further processes of a measurement: a service, a peer. They end with the object, and at the latest with the program.
 #pragma once
 
 #include <filesystem>
@@ -17,7 +16,7 @@ public:
     ChildProcess() = default;
     // Runs `body` in a copy of this process, which then ends.
     static ChildProcess run(const std::function<void()>& body);
-    // Runs a program with nothing but this environment ("NAME=value"); its output goes to the file.
+    // Runs a program with exactly this environment ("NAME=value"); its output goes to the file.
     static ChildProcess execute(const std::vector<std::string>& command, const std::vector<std::string>& environment,
                                 const std::filesystem::path& output);
 
@@ -39,7 +38,7 @@ private:
     pid_t identifier_ = 0;
 };
 
-// A directory that goes, with all that is in it.
+// A directory that is removed, with its content, at the end.
 class TemporaryDirectory {
 public:
     TemporaryDirectory();
@@ -52,8 +51,8 @@ private:
     std::filesystem::path path_;
 };
 
-// Keeps this process and others, with all their threads, on one processor as long as it lives: what is measured then
-// is work and switching, without the time that a processor needs to wake from its sleep.
+// Keeps this process and others, with all their threads, on one processor as long as it lives: measurements then show
+// work and switching, without the time that a sleeping processor needs to wake up.
 class OneProcessor {
 public:
     explicit OneProcessor(std::initializer_list<pid_t> others);
@@ -65,7 +64,7 @@ private:
     std::vector<pid_t> processes_;
 };
 
-// What the kernel counted: times that a thread of the process stopped running, and the memory that it has.
+// The kernel's counts: how often threads of the process stopped running, and its memory.
 [[nodiscard]] double contextSwitches(pid_t process);
 [[nodiscard]] double residentMegabytes(pid_t process);
 

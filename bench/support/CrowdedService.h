@@ -1,4 +1,4 @@
-// A service inside this process with as many clients as a measurement wants, which no socket holds up.
+// A service inside this process with any number of clients, without the delays of sockets.
 #pragma once
 
 #include "platform/Connection.h"
@@ -31,7 +31,7 @@ public:
         }
     }
 
-    // Answers to come hold their connections, which hold what answers.
+    // Pending answers hold their connections, which hold the handlers.
     ~CrowdedService()
     {
         for (const auto& connection : connections_)
@@ -55,7 +55,7 @@ private:
         void stop() override { }
     };
 
-    // A connection without a socket: it delivers the calls that it is told to.
+    // A connection without a socket: it delivers the calls that the measurement makes.
     class Connection final : public platform::Connection, public std::enable_shared_from_this<Connection> {
     public:
         void deliver(foundation::Array call) { (void)callHandler_({std::move(call), shared_from_this()}); }

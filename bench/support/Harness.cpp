@@ -1,4 +1,4 @@
-// One round a turn: whatever the machine does meanwhile, it does to every contestant.
+// The contestants take turns by rounds, so that disturbances by the machine affect all of them.
 #include "support/Harness.h"
 
 #include <algorithm>

@@ -1,7 +1,7 @@
-// What all measurements have in common: rounds in which the contestants take turns, and medians.
+// The common part of all measurements: rounds in which the contestants take turns, and medians.
 //
-// The machine is noisy, and its noise comes in stretches. So a figure and its peer's are never taken one after
-// the other in whole, but round by round in turns, and what counts is the median of the rounds.
+// The machine's noise comes in stretches. So a figure and its peer's are measured round by round in turns, and the
+// result is the median of the rounds.
 #pragma once
 
 #include <array>
@@ -61,10 +61,10 @@ using Clock = std::chrono::steady_clock;
     return std::chrono::duration<double, std::nano>(Clock::now() - start).count();
 }
 
-// The processor time that this thread has had, in nanoseconds: what others do on the machine is not in it.
+// The processor time of this thread, in nanoseconds, without that of other threads.
 [[nodiscard]] double processorTime();
 
-// How many nanoseconds of processor time one call of `work` takes, of `count` that follow each other.
+// The nanoseconds of processor time that one call of `work` takes, on average over `count` calls.
 template <typename Work> double nanosecondsEach(std::size_t count, Work work)
 {
     const double start = processorTime();
@@ -73,7 +73,7 @@ template <typename Work> double nanosecondsEach(std::size_t count, Work work)
     return (processorTime() - start) / static_cast<double>(count);
 }
 
-// Has the compiler believe that the value is used.
+// Makes the compiler treat the value as used.
 template <typename Value> void use(const Value& value)
 {
     asm volatile("" : : "g"(&value) : "memory");

@@ -38,7 +38,7 @@ public:
     InProcessPlatform(const InProcessPlatform&) = delete;
     InProcessPlatform& operator=(const InProcessPlatform&) = delete;
 
-    // Gives every notification that state, and calls whoever is registered for the name.
+    // Gives every notification that state, and calls the handlers of the name.
     void post(std::string_view name, std::uint64_t state) { notifications_.post(name, state); }
 
 private:

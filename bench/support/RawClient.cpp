@@ -1,5 +1,5 @@
-// Requests are one string in which only the number changes, answers a count of bytes: as little as possible is left of
-// the client in what is measured.
+// Requests are one string in which only the number changes, and answers are only counted in bytes, so that the client's
+// own cost in a measurement is minimal.
 #include "support/RawClient.h"
 
 #include "support/SampleMessage.h"
@@ -74,7 +74,7 @@ void RawClient::roundTrip()
     while (readAnswers(0) == 0) { }
 }
 
-// How many became whole.
+// Returns how many answers became complete.
 std::size_t RawClient::readAnswers(int flags)
 {
     const ssize_t count = ::recv(socket_.get(), answers_.data(), answers_.size(), flags);

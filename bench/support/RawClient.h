@@ -1,5 +1,5 @@
-// The plainest client that there can be: it writes a request that was encoded before, and reads as many bytes as the
-// answer has. Service and peers are called by the same one, so that what differs is only who answers.
+// The simplest client: it writes a request that was encoded before, and reads as many bytes as the answer has. It calls
+// the service and the peers alike, so that only the servers differ.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -13,7 +13,7 @@
 
 namespace bench {
 
-// A request, and the places where its running number stands, in four bytes.
+// A request, and the places of its running number of four bytes.
 struct Request {
     std::string bytes;
     std::vector<std::size_t> places;
@@ -47,7 +47,7 @@ private:
     const std::size_t answerSize_;
     std::uint32_t number_;
     std::string answers_; // room for reading
-    std::size_t partOfAnswer_ = 0; // bytes of one that is not whole yet
+    std::size_t partOfAnswer_ = 0; // bytes of an incomplete answer
 };
 
 // A pair of connected Unix stream sockets.
@@ -57,7 +57,7 @@ struct SocketPair {
     platform::FileDescriptor server;
 };
 
-// Connects to a Unix stream socket; an empty descriptor when nobody listens there.
+// Connects to a Unix stream socket; an empty descriptor if no server listens there.
 [[nodiscard]] platform::FileDescriptor connectTo(const std::filesystem::path& path);
 void writeAll(int socket, std::string_view bytes);
 // Reads exactly so many bytes; false at the end of the stream.

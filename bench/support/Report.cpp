@@ -11,7 +11,7 @@ namespace {
 using Cells = std::array<std::string, 7>;
 constexpr std::array<bool, 7> isAlignedRight{false, true, false, true, true, true, false};
 
-// Three digits that count.
+// Three significant digits.
 std::string numberText(double number)
 {
     const double size = std::abs(number);

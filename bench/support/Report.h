@@ -1,5 +1,5 @@
-// What was measured: one row a figure, with the peer's figure beside it and the target that it is held to. Shown as
-// a table for people and as JSON for machines.
+// The results: one row for each figure, with the peer's figure and the target. Shown as a table for people and as JSON
+// for programs.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -12,7 +12,7 @@
 
 namespace bench {
 
-// What a row promises.
+// The target of a row.
 struct Target {
     enum class Of : std::uint8_t { Figure, Ratio };
     enum class Bound : std::uint8_t { AtMost, AtLeast };
@@ -46,7 +46,7 @@ struct Row {
 class Report {
 public:
     void add(Row row) { rows_.push_back(std::move(row)); }
-    // A row that could not be measured on this machine, and why.
+    // Adds a row that could not be measured on this machine, and the reason.
     void skip(std::string what, std::string reason) { skipped_.push_back({std::move(what), std::move(reason)}); }
 
     [[nodiscard]] std::string table() const;

@@ -1,4 +1,4 @@
-// Each kind of value that players send is in it.
+// The message holds each kind of value that players send.
 #include "support/SampleMessage.h"
 
 namespace bench {

@@ -1,5 +1,5 @@
-// The message that everything is measured with: ten entries such as a player sends when its output starts, about 256
-// bytes of CBOR. A running number in it makes every message a new one, which is recorded.
+// The message of all measurements: ten entries such as a player sends when its output starts, about 256 bytes of CBOR.
+// A running number makes every message different, so that it is recorded.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -14,8 +14,8 @@ constexpr AudioEventCategory sampleCategory = 4; // Playback
 constexpr std::uint16_t sampleType = 1; // Start
 constexpr std::int64_t sampleReporterID = 42;
 
-// Where a message is encoded once for all, this number is the place of the running number. So is the first running
-// number: from there on all numbers take as many bytes.
+// In a message that is encoded in advance, this number marks the place of the running number. It is also the first
+// running number: from it on all numbers take as many bytes.
 constexpr std::uint32_t numberMark = 0x5EED'0001;
 
 [[nodiscard]] foundation::Dictionary sampleMessage(std::uint32_t number = numberMark);

@@ -1,4 +1,4 @@
-// Clients connect as soon as the socket is there, and speak the protocol as it stands on the wire.
+// Clients connect as soon as the socket exists, and use the wire protocol directly.
 #include "support/ServiceProcess.h"
 
 #include "foundation/cbor/Cbor.h"

@@ -1,4 +1,4 @@
-// The real service, in directories of its own, and what its clients send.
+// The real service, in directories of its own, and its clients' messages.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -16,7 +16,7 @@ class ServiceProcess {
 public:
     enum class Build : std::uint8_t { Customer, Internal };
 
-    // `analytics` is what analytics.toml says. Returns before the service listens.
+    // `analytics` is the content of analytics.toml. Returns before the service listens.
     explicit ServiceProcess(const Options& options, std::string_view analytics = "used = []",
                             Build build = Build::Customer);
 

@@ -1,9 +1,9 @@
-// A tiny driver helper that publishes what a mixer does: how many cycles were late, how long cycles take, and whether
-// it runs. The service reports at the end of each session how that changed over it.
+// A tiny driver helper that publishes a mixer's statistics: how many cycles were late, how long cycles take, and
+// whether it runs. The service reports at the end of each session how these changed.
 //
 //     cc driver.c $(pkg-config --cflags --libs kesto) -o driver && ./driver
 //
-// It mixes nothing. Where a real one would be called back by its device, it counts.
+// It does not mix: where a real mixer would have a callback from its device, it only counts.
 #include <kesto/channels.h>
 
 #include <stdio.h>
@@ -32,7 +32,7 @@ static kesto_status createChannels(Mixer* mixer, kesto_publisher* publisher)
     return status;
 }
 
-// What a real helper does in its real-time thread: no lock, no allocation, no wait.
+// A real helper does this in its real-time thread: no lock, no allocation, no wait.
 static void finishCycle(Mixer* mixer, int64_t microseconds)
 {
     kesto_channel_record(mixer->duration, microseconds);

@@ -1,9 +1,9 @@
-// A tiny driver helper that publishes what a mixer does: how many cycles were late, how long cycles take, and whether
-// it runs. The service reports at the end of each session how that changed over it.
+// A tiny driver helper that publishes a mixer's statistics: how many cycles were late, how long cycles take, and
+// whether it runs. The service reports at the end of each session how these changed.
 //
 //     c++ driver.cpp $(pkg-config --cflags --libs kesto) -o driver && ./driver
 //
-// It mixes nothing. Where a real one would be called back by its device, it counts.
+// It does not mix: where a real mixer would have a callback from its device, it only counts.
 #include <kesto/channels.hpp>
 
 #include <cstdint>
@@ -28,7 +28,7 @@ public:
 
     void enter(State state) { state_.enter(state); }
 
-    // What a real helper does in its real-time thread: no lock, no allocation, no wait.
+    // A real helper does this in its real-time thread: no lock, no allocation, no wait.
     void finishCycle(std::int64_t microseconds)
     {
         duration_.record(microseconds);
@@ -47,7 +47,7 @@ private:
 int main()
 {
     kesto::Publisher publisher;
-    Mixer mixer; // after its publisher, so that it goes first
+    Mixer mixer; // declared after its publisher, so that it is destroyed first
     auto status = publisher.open();
     if (status == kesto::Status::Ok)
         status = mixer.publish(publisher);

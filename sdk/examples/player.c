@@ -2,7 +2,7 @@
 //
 //     cc player.c $(pkg-config --cflags --libs kesto) -o player && ./player
 //
-// It plays nothing. Where a real player would start its output, it sends "Playback", "Start", and so on.
+// It does not play: where a real player would start its output, it only sends "Playback", "Start", and so on.
 #include <kesto/kesto.h>
 
 #include <stdio.h>
@@ -20,7 +20,7 @@ static void stateChanged(void* user, const kesto_state_change* change)
         fprintf(stderr, "player: %s (%s)\n", kesto_error_text(change->reason), change->socket_path);
 }
 
-// Called on the client's thread, for each answer of the call that it was given to.
+// Called on the client's thread for each answer to the call that got it as callback.
 static void sessionEnded(void* user, const kesto_answer* answer)
 {
     (void)user;
@@ -30,7 +30,7 @@ static void sessionEnded(void* user, const kesto_answer* answer)
         puts("the session's run has ended");
 }
 
-// What a real player does in its audio thread: no lock, no allocation, no system call.
+// A real player does this in its audio thread: no lock, no allocation, no system call.
 static void report(kesto_client* client, kesto_message* message, bool running, kesto_event_type type)
 {
     const kesto_reporter reporter = REPORTER;

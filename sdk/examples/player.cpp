@@ -2,7 +2,7 @@
 //
 //     c++ -std=c++17 player.cpp $(pkg-config --cflags --libs kesto) -o player && ./player
 //
-// It plays nothing. Where a real player would start its output, it sends "Playback", "Start", and so on.
+// It does not play: where a real player would start its output, it only sends "Playback", "Start", and so on.
 #include <kesto/kesto.hpp>
 
 #include <chrono>
@@ -25,7 +25,7 @@ public:
             std::cerr << "player: " << kesto::errorText(status) << '\n';
     }
 
-    // What a real player does in its audio thread: no lock, no allocation, no system call.
+    // A real player does this in its audio thread: no lock, no allocation, no system call.
     void report(bool running, kesto::EventType type)
     {
         message_.clear();
@@ -46,8 +46,8 @@ public:
     }
 
 private:
-    // On the client's thread. Every connection begins without sessions; what is given here comes before messages that
-    // were sent while the connection was being made.
+    // On the client's thread. Every connection begins without sessions; calls that are made here go before messages
+    // that were sent while the connection was being made.
     void stateChanged(const kesto::StateChange& change)
     {
         if (change.state == kesto::State::Disconnected)
@@ -73,7 +73,7 @@ private:
 
     const kesto::ReporterID reporter_ = randomReporter(); // unique in the whole system
     kesto::Message message_;
-    kesto::Client client_; // last: its thread ends before what its callbacks use
+    kesto::Client client_; // declared last: its thread must end before the members that its callbacks use
 };
 
 } // namespace

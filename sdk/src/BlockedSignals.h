@@ -1,4 +1,4 @@
-// The library's threads handle no signal of the program.
+// The library's threads do not handle the program's signals.
 #pragma once
 
 #include <csignal>

@@ -1,4 +1,4 @@
-// A caller's function with what belongs to it, released exactly once whatever becomes of the call.
+// A caller's function with its user pointer, released exactly once, even if the call fails.
 #pragma once
 
 #include "kesto/kesto.h"
@@ -7,7 +7,7 @@
 
 namespace libkesto {
 
-// Plain data: how a callback travels through the queue.
+// Plain data: the form of a callback in the queue.
 struct RawCallback {
     kesto_answer_callback function = nullptr;
     void* user = nullptr;
@@ -36,7 +36,7 @@ public:
             raw_.function(raw_.user, &answer);
     }
 
-    // Hands the release on to whoever takes the raw callback.
+    // Passes the duty to release to the receiver of the raw callback.
     [[nodiscard]] const RawCallback& raw() const noexcept { return raw_; }
     void handOver() noexcept { raw_ = {}; }
 

@@ -1,4 +1,4 @@
-// What became of the messages, counted where it happens and read at any time.
+// Counts of sent, answered and lost messages, which can be read at any time.
 #pragma once
 
 #include "kesto/kesto.h"
@@ -22,12 +22,12 @@ private:
 struct Counters {
     static constexpr std::size_t cacheLine = 64;
 
-    // By callers.
+    // Callers change these.
     alignas(cacheLine) Counter queued;
     Counter droppedQueueFull;
     Counter droppedNotConnected;
     Counter droppedUnusable;
-    // By the client's thread.
+    // The client's thread changes these.
     alignas(cacheLine) Counter sent;
     Counter answered;
     Counter refused;

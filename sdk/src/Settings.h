@@ -13,7 +13,7 @@
 
 namespace libkesto {
 
-// Told about every change of state, and released once. One thread at a time.
+// Called at every change of state, and released once. One thread at a time.
 class StateListener {
 public:
     StateListener(kesto_state_callback function, void* user, kesto_release_callback release) noexcept

@@ -1,4 +1,4 @@
-// What can fail is done before anything is exchanged; the exchange itself is one call of the kernel's.
+// All steps that can fail come before the exchange, which is one system call.
 #include "Tracer.h"
 
 #include "platform/linux/trace/TraceMarker.h"
@@ -33,7 +33,8 @@ using platform::FileDescriptor;
 using platform::TraceMarkerPage;
 using platform::TraceMarkerRecord;
 
-// Whether it is of the right size and stays so: reading from a page that is gone from its file kills the program.
+// Whether the file has the right size and is sealed against shrinking: reading a page beyond a file's end kills the
+// program.
 bool isPage(const FileDescriptor& file) noexcept
 {
     struct stat status = {};
@@ -87,7 +88,7 @@ void Tracer::emit(std::uint32_t code, const std::array<std::uint64_t, 4>& argume
     errno = before;
 }
 
-// The marker first: events are only emitted once the page says so.
+// Exchanges the marker first: callers emit only after the page shows a trace.
 bool Tracer::attach(TraceDescriptors descriptors) noexcept
 {
     const auto& [marker, page] = descriptors;
@@ -95,8 +96,8 @@ bool Tracer::attach(TraceDescriptors descriptors) noexcept
         && mapPage(page_, MAP_SHARED | MAP_FIXED, page.get()) != MAP_FAILED;
 }
 
-// The marker first, too: who sees that nobody traces writes to nobody. Neither can fail for what is there already: no
-// new descriptor, no new range of addresses.
+// Exchanges the marker first, too, so that late events are discarded. Neither exchange can fail, because it needs
+// neither a new descriptor nor a new range of addresses.
 void Tracer::detach() noexcept
 {
     static_cast<void>(::dup3(nowhere_.get(), marker_.get(), O_CLOEXEC));

@@ -9,7 +9,7 @@ struct KestoReportingDriver {
     std::optional<std::string> groupName;
     std::optional<std::string> subGroupName;
 
-    // What stands for an absent name, in keys and in the log.
+    // The text for an absent name, in keys and in the log.
     static constexpr std::string_view absentName = "(null)";
 
     // "group-subgroup"; the key of this driver in snapshots.

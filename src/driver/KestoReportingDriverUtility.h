@@ -1,5 +1,5 @@
-// The driver-statistics sampler: subscribes once to what the audio and haptics drivers publish, takes snapshots,
-// and tells how the drivers' counters changed over a session.
+// The driver-statistics sampler: subscribes once to the channels of audio and haptics drivers, takes snapshots, and
+// reports how the drivers' counters changed during a session.
 #pragma once
 
 #include "driver/KestoReportingIOChannelSubscription.h"
@@ -12,13 +12,13 @@
 #include <string_view>
 #include <vector>
 
-// Made once by the service object; then used on the server queue.
+// The service object makes it once and then uses it on the server queue.
 class KestoReportingDriverUtility {
 public:
     // Statistics by key, gathered before they become a dictionary.
     using DriverStats = foundation::Dictionary::Entries;
 
-    // Subscribes to the eight driver groups; one that cannot be subscribed to is left out.
+    // Subscribes to the eight driver groups; leaves out a group if this fails.
     KestoReportingDriverUtility();
 
     [[nodiscard]] const std::vector<KestoReportingIOChannelSubscription>& ioChannelSubscriptions() const
@@ -26,19 +26,19 @@ public:
         return ioChannelSubscriptions_;
     }
 
-    // A sample of every subscribed driver, by the driver's description. One that fails is missing.
+    // A sample of every subscribed driver, by the driver's description. A sample that fails is left out.
     [[nodiscard]] KestoReportingDriverSnapShot getSnapShot() const;
 
     // Sends the session, and with the turn the analytics bridge, what changed since the session's snapshot: simple
     // values, histograms and states, each as one message, none where nothing changed.
     void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) const;
 
-    // Each adds one channel of a difference of samples, if there is something to say about it.
+    // Each adds one channel of a difference of samples, if it has something to report.
     static void processSimpleData(const platform::ReportingChannel& channel, DriverStats& driverStats);
     static void processHistogramData(const platform::ReportingChannel& channel, DriverStats& driverStats);
     static void processStateData(const platform::ReportingChannel& channel, DriverStats& driverStats);
 
-    // "driver_group_subgroup_type_channel", without what the channel does not have.
+    // "driver_group_subgroup_type_channel", without the parts that the channel does not have.
     [[nodiscard]] static std::string getDriverStatsKey(const platform::ReportingChannel& channel,
                                                        std::string_view type);
 

@@ -1,5 +1,5 @@
-// How the drivers' channels changed over a session, put into words: one entry a channel, in a dictionary for
-// each kind of channel.
+// How the drivers' channels changed during a session, as text: one entry for each channel, in a dictionary for each
+// kind of channel.
 #include "driver/KestoReportingDriverUtility.h"
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
@@ -38,7 +38,7 @@ void processChannel(const platform::ReportingChannel& channel, DriverStatsByForm
               channel.format, channel.group.value_or("(null)"), channel.subgroup.value_or("(null)"));
 }
 
-// How the driver's channels changed since the snapshot; what goes wrong is logged, and nothing comes back.
+// How the driver's channels changed since the snapshot; on failure it logs the error and returns nothing.
 std::optional<platform::ReportingSample> differenceSince(const KestoReportingDriverSnapShot& snapShot,
                                                          const std::string& driver,
                                                          const platform::ReportingSample& sample)
@@ -66,7 +66,7 @@ void send(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& se
     KestoReportingFennicBridge::handleEvent(turn, message, categoryCavlet, type, session);
 }
 
-// Keys join their parts with "_", so no part may have one of its own.
+// Keys join their parts with "_", so parts must not contain one.
 void appendCleaned(std::string_view component, std::string& key)
 {
     std::ranges::copy_if(component, std::back_inserter(key),

@@ -1,5 +1,5 @@
-// A mutex that clang can reason about: it proves that what a lock guards is touched only under it. And a
-// condition to wait for while holding it.
+// A mutex with annotations, by which clang proves that guarded fields are used only under their lock; and a condition
+// on which a thread waits while it holds the mutex.
 #pragma once
 
 #include <chrono>
@@ -61,7 +61,8 @@ private:
     Mutex& mutex_;
 };
 
-// Sleeps until somebody tells that what a mutex guards has changed. It may wake for nothing: wait in a loop.
+// A thread sleeps on it until another thread signals a change of guarded data. It may wake without a signal: wait in a
+// loop.
 class Condition {
 public:
     void wait(Mutex& mutex) KESTO_REQUIRES(mutex)
@@ -70,7 +71,7 @@ public:
         condition_.wait(lock);
         lock.release(); // the caller goes on holding it
     }
-    // Tells whether it woke because of the deadline.
+    // Returns whether it woke because of the deadline.
     std::cv_status waitUntil(Mutex& mutex, std::chrono::steady_clock::time_point deadline) KESTO_REQUIRES(mutex)
     {
         std::unique_lock lock(mutex.mutex_, std::adopt_lock);

@@ -1,4 +1,4 @@
-// The analytics-event service: keeps named events whose names somebody wants.
+// The analytics-event service: keeps events whose names the device's configuration selects.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -16,7 +16,7 @@ public:
     using PayloadBuilder = std::move_only_function<foundation::Dictionary()>;
 
     virtual ~Analytics() = default;
-    // Whether some consumer on the device wants events of that name now.
+    // Whether the device keeps events of that name now.
     [[nodiscard]] virtual bool isAnalyticsEventUsed(std::string_view eventName) = 0;
     // Sends an event: with the turn, which is kept as a whole when it is over, or outside of any, at once. Of the
     // events of one turn the order is kept, and of those that one thread sends outside of turns. The builder is called

@@ -1,4 +1,4 @@
-// A signature is the same wherever snapshots are kept.
+// Signatures, which are the same for all providers.
 #include "platform/BugCapture.h"
 
 namespace platform {

@@ -18,13 +18,13 @@ public:
     using Reply = std::move_only_function<void(foundation::Dictionary response)>;
 
     virtual ~BugCaptureReporter() = default;
-    // A dictionary of the arguments by their names, without those that there are not.
+    // A dictionary of the arguments by their names, without absent ones.
     [[nodiscard]] virtual foundation::Dictionary
     makeSignature(std::string_view domain, std::string_view type, std::string_view subType,
                   std::string_view subtypeContext, std::string_view detectedProcess,
                   const std::optional<foundation::Value>& triggerThresholdValues);
-    // The reply comes later, on a queue of the service's choosing: once, also when no snapshot is taken and when the
-    // reporter is gone. Its "success" says whether one was.
+    // The reply comes later, once, on a queue that the service chooses, even if no snapshot is taken or the reporter
+    // has been destroyed. Its "success" tells whether a snapshot was taken.
     virtual void requestSnapshot(foundation::Dictionary signature, double duration,
                                  const std::optional<foundation::Value>& event,
                                  const std::optional<foundation::Value>& payload, Reply reply) = 0;
@@ -36,13 +36,13 @@ public:
     virtual ~BugCapture() = default;
     [[nodiscard]] virtual std::unique_ptr<BugCaptureReporter> makeReporter() = 0;
 
-    // How whoever asks for snapshots is at that moment, to be kept in them: it is asked with each request that leads to
-    // one, where and when that is made. To be set before the first; none unless it is.
+    // Describes the state of the requesting program, to be kept in the snapshot: called with each accepted request, on
+    // the requesting thread. Set it before the first request; without it snapshots hold no description.
     using StateDescription = std::function<foundation::Value()>;
     virtual void setStateDescription(const StateDescription& /*describe*/) { }
 
-    // The process whose message the calling thread is handling, or 0. Processes share names: a snapshot that is asked
-    // for meanwhile is of this one.
+    // The process whose message the calling thread is handling, or 0. Several processes may share a name; a snapshot
+    // that is requested meanwhile is of this process.
     [[nodiscard]] static std::int32_t currentSender() noexcept { return currentSender_; }
 
     // Makes a process the current sender of this thread while its message is being handled.

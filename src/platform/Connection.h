@@ -1,10 +1,10 @@
 // Inter-process connections, as the service sees them: a listener with a delegate, and connections that
 // deliver calls and carry replies back.
 //
-// A connection knows nothing of the operations: a call is an array of values, checked by whoever is
-// given it. All handlers of one connection run on one connection thread, in order: calls, then at most
-// one interruption, then one invalidation, after which nothing follows. What the peer sent before it went is
-// delivered before that; what it sent behind a call that breaks the protocol is not.
+// A connection does not know the operations: a call is an array of values, which the call handler checks. All handlers
+// of one connection run on one connection thread, in order: calls, then at most one interruption, then one
+// invalidation, which is the last. Calls that the peer sent before it went are delivered before these; calls behind one
+// that breaks the protocol are not delivered.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -21,13 +21,14 @@ namespace platform {
 
 class Connection {
 public:
-    // What a call handler answers to a call that breaks the protocol: the words that the log shows.
-    // The connection then ends.
+    // A call handler returns it for a call that breaks the protocol; its text goes to the log. The connection then
+    // ends.
     struct Violation {
         std::string reason;
     };
-    // One call, and the connection that it came from, which is never null. Whoever works on it keeps `caller` until it
-    // is answered: while a client's unanswered calls are too many or too large, the connection reads no more from it.
+    // One call, and the connection that it came from, which is never null. Code that works on a call keeps `caller`
+    // until the call is answered: while a client's unanswered calls are too many or too large, the connection stops
+    // reading from it.
     struct Call {
         foundation::Array frame;
         std::shared_ptr<Connection> caller;
@@ -52,19 +53,19 @@ public:
         const Connection* const outer_;
     };
 
-    // Who is at the other end, as the kernel told at acceptance. Any thread.
+    // The peer's process, as the kernel reported it at acceptance. Any thread.
     [[nodiscard]] virtual std::int32_t processIdentifier() const = 0;
-    // The peer in words, for the log. Any thread.
+    // A text that names the peer, for the log. Any thread.
     [[nodiscard]] virtual std::string description() const = 0;
 
-    // Before `resume`: what is called for each frame, when the connection broke, and when it is over (also
-    // after it broke, and when the peer closed it cleanly). All of them are held until the last has returned, and none
-    // after that.
+    // Call these before `resume`. The connection calls the first handler for each frame, the second when it breaks, and
+    // the third when it ends (after it broke, too, and when the peer closed it cleanly). It keeps all handlers until
+    // the last has returned, and then releases them.
     virtual void setCallHandler(CallHandler handler) = 0;
     virtual void setInterruptionHandler(EndHandler handler) = 0;
     virtual void setInvalidationHandler(EndHandler handler) = 0;
 
-    // Begins to read.
+    // Starts reading.
     virtual void resume() = 0;
 
     // Sends one frame, an encoded CBOR item, to the peer: it leaves after the turn, once everything that the turn
@@ -94,8 +95,8 @@ class ConnectionListener {
 public:
     virtual ~ConnectionListener() = default;
     virtual void setDelegate(ConnectionListenerDelegate& delegate) = 0; // must outlive the listener's run
-    // Accepts connections; keeps the calling thread until `stop` (which only tests call). The connections are
-    // invalidated before it returns.
+    // Accepts connections; returns after `stop` (which only tests call). It invalidates the connections before it
+    // returns.
     virtual void resume() = 0;
     virtual void stop() = 0;
 };

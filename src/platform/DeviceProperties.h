@@ -10,7 +10,7 @@ namespace platform {
 class DeviceProperties {
 public:
     virtual ~DeviceProperties() = default;
-    // The property's truth value, or nothing when the device does not have it.
+    // The property's truth value, or nothing if the device does not have the property.
     [[nodiscard]] virtual std::optional<bool> boolean(std::string_view name) const = 0;
 };
 

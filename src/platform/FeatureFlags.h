@@ -9,7 +9,7 @@ namespace platform {
 class FeatureFlags {
 public:
     virtual ~FeatureFlags() = default;
-    // False for a flag that nobody has set.
+    // False for a flag that is not set.
     [[nodiscard]] virtual bool isEnabled(std::string_view domain, std::string_view flag) const = 0;
 };
 

@@ -1,5 +1,4 @@
-// The few things that the service does with files: it writes those of its own, all of them below one folder, and reads
-// those that clients name.
+// The service's work with files: it writes its own files, all below one folder, and reads files that clients name.
 #pragma once
 
 #include <cstddef>
@@ -13,8 +12,8 @@
 
 namespace platform {
 
-// A file in the making. It takes the place of what stands under its name when it is committed, whole or not at
-// all; destroyed before that, it leaves nothing behind. One thread at a time.
+// An unfinished file. `commit` puts it in place of an older file of its name, completely or not at all; destroyed
+// before that, it leaves no file. One thread at a time.
 class AtomicFile {
 public:
     virtual ~AtomicFile() = default;
@@ -25,33 +24,35 @@ public:
     [[nodiscard]] virtual std::expected<void, std::error_code> commit() = 0;
 };
 
-// Files of one kind, and how many of them a folder may hold. Beyond that the oldest go, but never the newest.
+// Files of one kind, and how many of them a folder may hold. Beyond that the oldest are removed, but never the newest.
 struct KeptFiles {
     std::size_t most;
     std::uint64_t mostBytes; // of all together
-    bool (*isOne)(std::string_view name); // of a file name, whoever chose it. Any thread
+    bool (*isOne)(std::string_view name); // for any file name, also of other programs. Any thread
 };
 
-// Any thread. What is written lies below the diagnostic-log root; for other paths, `errc::invalid_argument` comes back.
+// Any thread. The functions that write return `errc::invalid_argument` for paths that are not below the diagnostic-log
+// root.
 class FileSystem {
 public:
     virtual ~FileSystem() = default;
     // The folder below which diagnostic files are kept. It exists when the service starts.
     [[nodiscard]] virtual std::filesystem::path diagnosticLogRoot() const = 0;
-    // Makes the folder and those above it that are missing, with exactly these permissions whatever the umask. Those
-    // that exist stay as they are. The root is made again, as it was, if it has gone. `errc::not_a_directory` where a
-    // file stands.
+    // Makes the folder and the missing folders above it, with exactly these permissions (the umask does not apply).
+    // Existing folders stay as they are. If the root was removed, it is made again as it was. `errc::not_a_directory`
+    // if a file is in the way.
     [[nodiscard]] virtual std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
                                                                                  unsigned permissions) = 0;
-    // Begins a file in a folder that exists. Several of one name may be in the making: the last that is committed
-    // counts.
+    // Begins a file in an existing folder. Several unfinished files may have one name: the one that is committed last
+    // stays.
     [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) = 0;
-    // Tells that a file of that kind, of so many bytes, has come into the folder: if there are too many now, the oldest
-    // are removed in the background. Does not look into the folder itself.
+    // Reports that a file of that kind, with so many bytes, was added to the folder: if the folder now holds too many,
+    // the oldest are removed in the background. Does not itself read the folder.
     virtual void keepWithin(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes) = 0;
-    // The bytes of a file anywhere, whoever named it. Does not wait, and takes no more memory than the limit (bytes):
-    // `errc::file_too_large` when the file is longer, `errc::invalid_argument` when the path is no regular file's.
+    // The bytes of a file at any path, also one that a client names. Does not wait, and takes no more memory than the
+    // limit (bytes): `errc::file_too_large` if the file is longer, `errc::invalid_argument` if it is not a regular
+    // file.
     [[nodiscard]] virtual std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,
                                                                                std::size_t limit) = 0;
 };

@@ -31,29 +31,28 @@ struct KernelTraceEvent {
 };
 static_assert(sizeof(void*) != 8 || sizeof(KernelTraceEvent) == 96);
 
-// One trace session. Its handlers run on the queue that `start` was given, in the order of time.
-//
-// It may be destroyed by its own completion handler. Destroyed before it is complete, it is never completed; what is
-// on its way to the queue already may still be delivered. Then its handlers are let go of.
+// One trace session. Its handlers run on the queue of `start`, in the order of time. Its own completion handler may
+// destroy it. If it is destroyed before it is complete, its completion handler does not run; events that are already on
+// their way to the queue may still be delivered. Afterwards its handlers are released.
 class KernelTraceSession {
 public:
     virtual ~KernelTraceSession() = default;
-    // Runs once, after the session ended and everything was delivered; not for one that was never given a queue. Before
-    // `start`.
+    // The handler runs once, after the session ended and all events were delivered; not if the session never got a
+    // queue. Call this before `start`.
     virtual void setCompletionHandler(std::function<void()> handler) = 0;
-    // Whether events are to carry their wall-clock time. Before `start`; at first they do not.
+    // Whether events carry their wall-clock time; by default they do not. Call this before `start`.
     virtual void enableWallTimes(bool enabled) = 0;
-    // 0 or an error number: for a range or a handler that is none, and after `start`. Both codes are in the range.
-    // Every handler whose range has the code gets the event.
+    // Every handler whose range holds the event's code gets the event. Both codes are in the range. Returns 0, or an
+    // error number for an empty range, for an empty handler, and after `start`.
     virtual int filterEventRange(std::uint32_t firstCode, std::uint32_t lastCode,
                                  std::function<void(const KernelTraceEvent&)> handler) = 0;
-    // 0 or an error number: without a queue, for a session that was started before, and where the system refuses. A
-    // session that the system refused is ended and completed like any other.
+    // Returns 0, or an error number without a queue, for a session that was started before, and if the system refuses.
+    // A session that the system refused is ended and completed like any other.
     virtual int start(std::shared_ptr<WorkQueue> queue) = 0;
-    // Once; more often does nothing.
+    // Ends the session; further calls have no effect.
     virtual void end() = 0;
-    // How many events were lost while it ran, of which some or all may not have been its own: known once it is
-    // complete, so ask in the completion handler.
+    // How many events were lost while it ran, including events of other sessions. Known when the session is complete,
+    // so call it in the completion handler.
     [[nodiscard]] virtual std::uint64_t lostEvents() const = 0;
     [[nodiscard]] virtual std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const = 0;
 };
@@ -64,7 +63,7 @@ public:
     virtual ~KernelTrace() = default;
     // Whether this system can trace. Where it cannot, the "Tracing" feature counts as off.
     [[nodiscard]] virtual bool isAvailable() = 0;
-    // Null on a system that cannot.
+    // Null on a system that cannot trace.
     [[nodiscard]] virtual std::unique_ptr<KernelTraceSession> createTraceSession() = 0;
 };
 

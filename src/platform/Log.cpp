@@ -1,5 +1,5 @@
-// From a statement that is let through to one record: the message is formatted here, once for all statements, so that
-// each of them is a small call.
+// Makes a record of an enabled statement: the message is formatted here for all statements, so that each statement is a
+// small call.
 #include "platform/Log.h"
 
 #include "platform/Platform.h"

@@ -1,8 +1,8 @@
 // Log categories and the statements that write to them.
 //
-// A statement below its category's threshold costs a load and a branch: nothing of it is evaluated.
-// Above it, the line starts with a name for the source file, right-aligned, and the line number, so that a
-// reader finds the statement; the sink decides where the line goes.
+// A disabled statement costs a load and a branch: its arguments are not evaluated. The line of an enabled statement
+// starts with a name for the source file, right-aligned, and the line number, so that a reader finds the statement; the
+// platform's log decides where the line goes.
 #pragma once
 
 #include <atomic>
@@ -13,7 +13,7 @@
 
 namespace platform {
 
-// From the most to the least important. A threshold lets through its own level and everything before it.
+// From the most to the least important. A threshold enables its own level and all levels before it.
 enum class LogLevel : std::uint8_t { Error, Default, Info, Debug };
 
 [[nodiscard]] std::string_view name(LogLevel level) noexcept;
@@ -38,20 +38,20 @@ public:
             && (threshold != unresolved || isEnabledOnceResolved(level));
     }
 
-    // Forgets the threshold, so that the next statement asks the current platform's log. For its installation.
+    // Forgets the threshold, so that the next statement asks the current platform's log. `platform::install` calls it.
     void forgetThreshold() noexcept { threshold_.store(unresolved, std::memory_order_relaxed); }
 
 private:
     bool isEnabledOnceResolved(LogLevel level) noexcept;
 
-    static constexpr std::uint8_t unresolved = 255; // lets everything through to the slow path
+    static constexpr std::uint8_t unresolved = 255; // sends every statement to the slow path
 
     std::string_view subsystem_;
     std::string_view tag_;
     std::atomic<std::uint8_t> threshold_{unresolved};
 };
 
-// Where a log statement stands.
+// The place of a log statement in the source.
 struct LogLocation {
     // Of a path such as __FILE__. The prefix shows the file's name without its extension, unless it is given another.
     consteval LogLocation(std::string_view path, int lineNumber, std::string_view shownName = {})
@@ -73,13 +73,13 @@ struct LogRecord {
     std::string_view message; // without the prefix
 };
 
-// The platform's log. Its functions are called from any thread, several at once. Of the lines of one thread the order
-// is kept.
+// The platform's log. Its functions are called from any thread, also at the same time. The lines of one thread keep
+// their order.
 class Log {
 public:
     virtual ~Log() = default;
     [[nodiscard]] virtual LogLevel threshold(const LogCategory& category) const = 0;
-    // Writes the line, whatever the threshold: that is for those who ask before.
+    // Writes the line in any case: callers check the threshold before.
     virtual void write(const LogRecord& record) = 0;
 };
 
@@ -100,8 +100,8 @@ void writeLog(const LogCategory& category, LogLevel level, LogLocation location,
 
 } // namespace platform
 
-// What the prefix shows in place of the file's name: the files of the session and of the trace runner, whose lines
-// programs search for by that name, define it before they include anything.
+// The name that the prefix shows in place of the file's: the files of the session and of the trace runner define it
+// before their includes, because programs search for their lines by that name.
 #ifndef KESTO_LOG_NAME
 #define KESTO_LOG_NAME ""
 #endif

@@ -24,12 +24,12 @@ public:
     using Handler = std::function<void(std::int32_t token)>;
 
     virtual ~Notifications() = default;
-    // Calls the handler on the queue after each post of the name, from now until the process ends. For several posts
-    // that come before the handler has run, it may run once. A post counts also when the state stays the same.
+    // Calls the handler on the queue after each post of the name, until the process ends. For several posts before the
+    // handler has run, it may run once. A post counts even if the state stays the same.
     virtual Registration registerNotification(std::string_view name, std::shared_ptr<WorkQueue> queue,
                                               Handler handler) = 0;
-    // The state that the registration's name carries now; a status other than 0 where there is none, and for a token
-    // that no registration was given.
+    // The present state of the registration's name; a status other than 0 if the name has no state, and for an unknown
+    // token.
     [[nodiscard]] virtual std::expected<std::uint64_t, NotificationStatus> state(std::int32_t token) const = 0;
 };
 

@@ -12,12 +12,12 @@ namespace platform {
 
 enum class PerformanceUnit : std::uint8_t { Nanoseconds };
 
-// An open file; destroying it flushes and closes. Until then the former file of its name stays in its place.
+// An open file; its destructor flushes and closes it. Until then the older file of its name stays in place.
 class PerformanceFile {
 public:
     virtual ~PerformanceFile() = default;
     virtual void write(std::string_view name, double value, PerformanceUnit unit) = 0;
-    // Says something of all measurements together, such as how many of them are missing; once for each key. A value
+    // Adds a remark about all measurements together, such as the number of missing ones; once for each key. A value
     // that holds a number which is not finite is kept as null.
     virtual void remark(std::string_view key, const foundation::Value& value) = 0;
 };
@@ -26,8 +26,8 @@ public:
 class PerformanceWriter {
 public:
     virtual ~PerformanceWriter() = default;
-    // Null when the file cannot be opened: its folder is missing or not below the diagnostic-log root, or a folder
-    // stands in its place.
+    // Null if the file cannot be opened: its folder is missing or not below the diagnostic-log root, or a folder has
+    // its name.
     [[nodiscard]] virtual std::unique_ptr<PerformanceFile> open(const std::filesystem::path& path,
                                                                 std::string_view project, std::uint32_t version) = 0;
 };

@@ -1,4 +1,4 @@
-// What is installed, and which log categories have learnt their threshold from it.
+// The installed platform, and the log categories that have their threshold from it.
 #include "platform/Platform.h"
 
 #include "foundation/Mutex.h"
@@ -14,7 +14,7 @@ namespace {
 std::optional<Platform> installed;
 std::atomic<std::uint64_t> installations;
 
-// The categories that know their threshold, which is the installed log's.
+// The categories that have the installed log's threshold.
 foundation::Mutex resolvedLock;
 std::vector<LogCategory*> resolved KESTO_GUARDED_BY(resolvedLock);
 

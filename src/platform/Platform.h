@@ -43,17 +43,17 @@ struct Platform {
     Memory& memory;
 };
 
-// Makes the platform current. While it is being changed nothing else may use it.
+// Makes the platform current. No other thread may use the platform meanwhile.
 void install(const Platform& platform);
-// Takes the current platform away again; log statements are then dropped.
+// Removes the current platform; log statements are then dropped.
 void uninstall();
 
 // The installed platform. Any thread.
 [[nodiscard]] Platform& current();
 [[nodiscard]] bool isInstalled() noexcept;
 
-// Counts the installations, from 1; what is remembered "once for the life of the process" is remembered for
-// one installation, so that tests can live several lives.
+// The number of installations so far. State that is kept "once for the life of the process" is kept for one
+// installation, so that each test starts anew.
 [[nodiscard]] std::uint64_t installationNumber() noexcept;
 
 } // namespace platform

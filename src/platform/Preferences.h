@@ -12,7 +12,7 @@ namespace platform {
 class Preferences {
 public:
     virtual ~Preferences() = default;
-    // The value stored now, or nothing. A change may be seen a moment late.
+    // The stored value, or nothing. A change may become visible a moment later.
     [[nodiscard]] virtual std::optional<foundation::Value> value(std::string_view domain,
                                                                  std::string_view key) const = 0;
 };

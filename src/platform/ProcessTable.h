@@ -10,7 +10,7 @@ namespace platform {
 // One process as the kernel lists it.
 struct ProcessTableEntry {
     std::int32_t processIdentifier = 0;
-    std::string commandName; // the kernel's short name, cut at 15 bytes; "?" stands for each that is not UTF-8
+    std::string commandName; // the kernel's short name, cut at 15 bytes; "?" for each byte that is not UTF-8
 };
 
 // Any thread.
@@ -19,9 +19,9 @@ public:
     virtual ~ProcessTable() = default;
     [[nodiscard]] virtual std::int32_t ownProcessIdentifier() const = 0;
     [[nodiscard]] virtual std::string ownProcessName() const = 0;
-    // The entry of that process, the own one too, or nothing when there is none. May be a moment old.
+    // The entry of that process, which may be this one, or nothing if it does not exist. May be a moment old.
     [[nodiscard]] virtual std::optional<ProcessTableEntry> entry(std::int32_t processIdentifier) const = 0;
-    // Whatever is remembered of that process is not believed any more: what `entry` tells next is as it is then.
+    // Drops the cached entry of that process: the next `entry` reads it anew.
     virtual void forget(std::int32_t /*processIdentifier*/) { }
 };
 

@@ -18,7 +18,7 @@ struct HistogramBucket {
     std::int64_t lower = 0;
     std::int64_t upper = 0;
     std::int64_t hits = 0;
-    std::int32_t boundsError = 0; // not 0 when the bounds could not be read
+    std::int32_t boundsError = 0; // not 0 if the bounds could not be read
 };
 
 struct StateResidency {
@@ -28,7 +28,7 @@ struct StateResidency {
     double dutyCycle = 0;
 };
 
-// One channel of a sample. What its format does not have stays empty.
+// One channel of a sample. Fields that its format does not have stay empty.
 struct ReportingChannel {
     std::uint8_t format = 0; // a `ChannelFormat`, or a number that this service does not know
     std::optional<std::string> driver;
@@ -45,7 +45,7 @@ struct ReportingChannel {
 
 struct ReportingSample {
     std::vector<ReportingChannel> channels;
-    // Whether all that was asked for could be looked at. Where not, a channel may be missing that is there.
+    // Whether all requested channels could be read. If not, an existing channel may be missing.
     bool isWhole = true;
 };
 
@@ -54,7 +54,7 @@ using ReportingChannelError = std::int64_t; // the platform's error code
 // Calls that may return a result and an error side by side return both as they came.
 class ReportingChannels {
 public:
-    // What the platform holds behind a set of channels and behind a subscription.
+    // The platform's own data of a set of channels or a subscription.
     class ChannelSet {
     public:
         virtual ~ChannelSet() = default;
@@ -75,18 +75,18 @@ public:
     };
 
     virtual ~ReportingChannels() = default;
-    // An absent group or subgroup means any. Where nobody publishes, a set without channels or none comes back, and no
-    // error.
+    // An absent group or subgroup means any. Without publishers it returns an empty set or none, and no error.
     virtual FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
                                               std::optional<std::string_view> subgroup) = 0;
-    // How many there were when the set was found.
+    // The number of channels when the set was made.
     [[nodiscard]] virtual std::size_t channelCount(const ChannelSet& channels) const = 0;
     virtual Subscribed createSubscription(const ChannelSet& channels) = 0;
-    // The channels of the group and subgroup as they are at that moment, those too that came after the subscription.
+    // The present channels of the group and subgroup, including those that came after the subscription.
     virtual std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
                                                                                 const ChannelSet& channels) = 0;
-    // What the counters of each channel of the later sample have gained; a channel that is new, or of which a counter
-    // began anew, counts whole. Extremes are the later ones, and a duty cycle is the share of the difference.
+    // The increase of each channel's counters up to the later sample; a new channel, or one whose counters began anew,
+    // counts with its whole content. Extremes are those of the later sample, and a duty cycle is the share of the
+    // difference.
     virtual std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,
                                                                                    const ReportingSample& to) = 0;
 };

@@ -10,7 +10,7 @@ namespace platform {
 class TraceMarkers {
 public:
     virtual ~TraceMarkers() = default;
-    // One kernel trace event; does nothing where nobody traces.
+    // Emits one kernel trace event; does nothing while no trace runs.
     virtual void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) = 0;
 };
 

@@ -1,8 +1,6 @@
-// Which clients have a session of a reporter ID, so that looking one up over all clients costs the same
-// however many there are.
-//
-// What it must equal is a walk over the registry in the order of registration that stops at the first client
-// which has the ID; so the clients of an ID are kept in that order.
+// Which clients have a session of a reporter ID, so that a look-up over all clients costs the same for any number of
+// clients. By definition the result is that of a walk over the registry, in the order of registration, that stops at
+// the first client with the ID; so the index keeps the clients of an ID in that order.
 #pragma once
 
 #include "foundation/values/IntegerHash.h"
@@ -14,14 +12,14 @@
 
 class KestoReportingClientServerInstance;
 
-// The owner keeps calls apart: one thread at a time. Clients that are not registered do not count.
+// One thread at a time, which the owner ensures. Clients that are not registered do not count.
 class KestoReportingReporterIndex {
 public:
     using Client = KestoReportingClientServerInstance;
 
     void registerClient(const Client& client) { registrationOf_.try_emplace(&client, nextRegistration_++); }
 
-    // Every ID of the client has been removed before.
+    // All IDs of the client must have been removed.
     void unregisterClient(const Client& client) { registrationOf_.erase(&client); }
 
     void add(std::int64_t reporterID, const Client& client)
@@ -41,7 +39,7 @@ public:
             clientsOf_.erase(clients);
     }
 
-    // The client registered first of those that have the ID, or null.
+    // Of the clients with the ID, the one that registered first, or null.
     [[nodiscard]] const Client* find(std::int64_t reporterID) const
     {
         const auto clients = clientsOf_.find(reporterID);

@@ -75,7 +75,7 @@ void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoRe
         reporterIndex_.registerClient(*client);
     }
     client->setClientStartDate(platform::current().clock.secondsSince1970());
-    platform::current().processTable.forget(client->processIdentifier()); // whoever had the number before it
+    platform::current().processTable.forget(client->processIdentifier()); // an earlier process may have had the number
     client->setClientProcessName(KestoReportingUtilityProcessNameForPID(client->processIdentifier()));
 }
 

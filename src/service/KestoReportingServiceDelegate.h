@@ -1,5 +1,5 @@
-// The one service object: it accepts connections, keeps the registry of clients, and knows what is the same for
-// all of them: the defaults, the master switch, the device-wide features.
+// The one service object: it accepts connections, keeps the registry of clients, and holds the common state of all
+// clients: the defaults, the master switch, the device-wide features.
 //
 // Client objects reach it only through `KestoReportingServiceDelegateProtocol`.
 #pragma once
@@ -22,8 +22,8 @@
 // Announces that the service's own preferences changed.
 constexpr std::string_view gReportingNotifydNotificationName = "com.quarn.kesto.reporting";
 
-// Acceptance and the handlers of a connection's end run on a connection thread; everything else on the server
-// queue, but for what the protocol says otherwise.
+// Acceptance and the handlers of a connection's end run on a connection thread; everything else on the server queue,
+// unless the protocol says otherwise.
 class KestoReportingServiceDelegate final : public KestoReportingServiceDelegateProtocol,
                                             public platform::ConnectionListenerDelegate,
                                             public std::enable_shared_from_this<KestoReportingServiceDelegate> {
@@ -60,8 +60,8 @@ public:
     void reporterIDRemoved(std::int64_t reporterID, const KestoReportingClientServerInstance& client) override;
 
 private:
-    // A device-wide setting that sessions are told. One with a defaults domain is read from the preferences under
-    // its own name; one without is the state of its notification.
+    // A device-wide setting that every session gets. A setting with a defaults domain is read from the preferences
+    // under its own name; a setting without one is the state of its notification.
     struct Feature {
         std::optional<std::string_view> defaultsDomain;
         std::string_view featureDomain;

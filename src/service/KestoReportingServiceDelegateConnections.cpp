@@ -1,5 +1,5 @@
-// A connection's beginning and end: the client object is made and registered, and when the peer is gone its
-// sessions are stopped and the time it was connected becomes an event.
+// A connection's beginning and end: the service makes and registers the client object; when the peer has gone, it stops
+// the client's sessions and sends an event with the time that the client was connected.
 #include "client/KestoReportingClientServerInstance.h"
 #include "client/KestoReportingServiceProtocolAdapter.h"
 #include "platform/Platform.h"

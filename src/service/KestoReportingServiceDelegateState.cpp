@@ -1,5 +1,5 @@
-// What a bug capture keeps of the service: how many clients and sessions there are, and of the sessions so many that
-// whoever asks for a snapshot does not feel it.
+// The description of the service in a bug capture: the numbers of clients and sessions, and the first sessions, so few
+// that the description does not delay the requesting thread.
 #include "client/KestoReportingClientServerInstance.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "utility/KestoReportingServerQueue.h"

@@ -1,5 +1,5 @@
-// kestod: puts the service object on the Linux platform and gives the main thread to the listener, for the life of
-// the process. There is no command line; the launch configuration is all in the environment.
+// kestod: puts the service object on the Linux platform and gives the main thread to the listener, for the life of the
+// process. It has no command line; the launch configuration is in the environment.
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/LinuxPlatform.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
@@ -14,7 +14,7 @@
 
 namespace {
 
-// One line that says why, and the status that keeps a service manager from trying again.
+// Prints one line with the reason; returns the status with which a service manager does not start the process again.
 int cannotRun(const std::string& reason)
 {
     std::fputs(("kestod: " + reason + "\n").c_str(), stderr);
@@ -31,8 +31,8 @@ std::expected<platform::ListeningSocket, std::string> takeSocket(platform::Launc
     return *std::move(socket);
 }
 
-// Clients rely on the service by now. What is thrown is no matter of the configuration any more: it ends the process as
-// it would on every other thread, and the service manager starts it again.
+// Clients rely on the service by now. An exception does not mean a wrong configuration any more: it ends the process,
+// as on every other thread, and the service manager starts the service again.
 int serve(platform::ConnectionListener& listener) noexcept
 {
     listener.resume();
@@ -44,7 +44,7 @@ int run()
     auto launch = platform::LaunchConfiguration::fromEnvironment();
     if (!launch)
         return cannotRun(launch.error());
-    auto socket = takeSocket(*launch); // first: a second service gives way before it opens the store of the first
+    auto socket = takeSocket(*launch); // first, so that a second service ends before it opens the store of the first
     if (!socket)
         return cannotRun(socket.error());
     auto listener = platform::LinuxConnectionListener::create(*std::move(socket), KestoReportingClientCategory());
@@ -65,10 +65,10 @@ int run()
 
 int main()
 {
-    std::signal(SIGPIPE, SIG_IGN); // nobody reads the log any more: no reason to end
+    std::signal(SIGPIPE, SIG_IGN); // the log's reader may end; the service goes on
     try {
         return run();
-    } catch (const std::exception& exception) { // what is thrown before anybody can connect: no memory, no threads
+    } catch (const std::exception& exception) { // thrown before clients can connect: out of memory or threads
         return cannotRun(exception.what());
     }
 }

@@ -1,4 +1,4 @@
-// The record's fields on the wire, in its text, and in what makes two records equal.
+// The record's fields on the wire, in its text, and in comparisons.
 #include "sinks/AudioIssueDetected.h"
 
 #include <functional>

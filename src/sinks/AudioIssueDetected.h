@@ -1,7 +1,5 @@
-// The record that the wireless-diagnostics metrics service takes for an audio issue that was detected.
-//
-// It is part of the message set, so that a receiver's record can be read and a record be made for one; no sink of this
-// service sends any.
+// The wireless-diagnostics metrics service's record of a detected audio issue. It is part of the message set, so that
+// programs can read a received record and make one; no sink of this service sends it.
 #pragma once
 
 #include "foundation/protobuf/ProtobufMessage.h"
@@ -14,7 +12,7 @@
 
 namespace trelmmetrics {
 
-// Text is bytes, as the wire has it: nobody has looked whether it is UTF-8.
+// Text is the bytes of the wire, which are not checked to be UTF-8.
 class AudioIssueDetected final : public foundation::ProtobufMessage {
 public:
     AudioIssueDetected() = default;
@@ -25,7 +23,7 @@ public:
     ~AudioIssueDetected() override = default;
 
     [[nodiscard]] std::expected<void, foundation::ProtobufError> readFrom(foundation::ProtobufReader& reader) override;
-    // The time stamp only when it is set; every other field, also when it is empty.
+    // Writes the time stamp only if it is set, and every other field even if it is empty.
     void writeTo(foundation::ProtobufWriter& writer) const override;
     void formatText(foundation::ProtobufTextFormatter& formatter, std::string_view name) const override;
 
@@ -47,7 +45,7 @@ public:
     void setRtaidclient(std::string_view rtaidclient) { rtaidclient_ = rtaidclient; }
 
     friend void swap(AudioIssueDetected& left, AudioIssueDetected& right) noexcept;
-    // A time stamp that is set, be it to 0, differs from one that is not.
+    // A time stamp of 0 differs from one that is not set.
     friend bool operator==(const AudioIssueDetected& left, const AudioIssueDetected& right) noexcept;
     friend std::size_t hash_value(const AudioIssueDetected& record) noexcept;
 

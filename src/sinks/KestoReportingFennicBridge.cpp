@@ -1,4 +1,4 @@
-// Both events of a message share one payload, which is built when the first of them needs it.
+// Both events of a message share one payload, which is built when the first event needs it.
 #include "sinks/KestoReportingFennicBridge.h"
 
 #include "foundation/text/Format.h"
@@ -56,8 +56,8 @@ EventNames makeEventNames(AudioEventCategory category, AudioEventType type, Audi
             foundation::format("com.quarn.{}.{}.{}", serviceName, categoryName, typeName)};
 }
 
-// Sessions say the same few things over and over: a thread's recent names are remembered, each at a place that its
-// numbers give.
+// Sessions repeat a few kinds of messages: each thread caches the recent names, each at a place that its numbers
+// determine.
 const EventNames& eventNames(AudioEventCategory category, AudioEventType type, AudioServiceType serviceType)
 {
     constexpr std::size_t remembered = 64;

@@ -1,7 +1,7 @@
 // The bridge to the analytics service: turns a message into events that carry its category and type in
 // their names, one for all services and one for the session's own.
 //
-// Nothing is filtered here. Whether an event is kept is decided by whether somebody wants its name.
+// It does not filter: the analytics service keeps or drops an event by its name.
 #pragma once
 
 #include "platform/Turn.h"

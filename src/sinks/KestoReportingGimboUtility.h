@@ -1,5 +1,5 @@
-// The power-log sink. It accepts every message and does nothing with it: the entry point is kept so that
-// such a service can be fed without touching the road of a message.
+// The power-log sink. It accepts every message and does nothing with it: with this entry point such a service can be
+// added without a change in the path of a message.
 #pragma once
 
 #include "sinks/KestoReportingSinkSession.h"

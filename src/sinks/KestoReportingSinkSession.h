@@ -1,4 +1,4 @@
-// What a sink sees of a session: enough to name an event and to say who played, and nothing more.
+// A sink's view of a session: only what it needs to name an event and the application.
 #pragma once
 
 #include "foundation/values/Value.h"

@@ -1,4 +1,5 @@
-// One step a message: it is no report, repeats the last one, is counted, or makes the second that asks for a snapshot.
+// One step for each message: it is not a report, or repeats the last one, or is counted, or is the second report, which
+// requests a snapshot.
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 
 #include "platform/Platform.h"

@@ -22,7 +22,7 @@ public:
     [[nodiscard]] std::uint64_t leakedHapticsSessionCounter() const { return leakedHapticsSessionCounter_; }
     // The report counted last.
     [[nodiscard]] const foundation::Dictionary& messageCache() const { return messageCache_; }
-    // The reporter of the snapshot requested last; null before the first.
+    // The reporter of the last requested snapshot; null before the first.
     [[nodiscard]] const platform::BugCaptureReporter* ulmetReporter() const { return ulmetReporter_.get(); }
 
 private:

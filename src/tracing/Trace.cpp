@@ -1,4 +1,4 @@
-// Handing the events round and gathering the results.
+// Passes the events to each measurement and collects the results.
 #include "tracing/Trace.h"
 
 #include "utility/KestoReportingLogCategories.h"

@@ -1,4 +1,4 @@
-// One trace: what it measures, and the values that were found.
+// One trace: its measurements and their results.
 #pragma once
 
 #include "tracing/TraceInterval.h"
@@ -6,13 +6,13 @@
 #include <map>
 #include <memory>
 
-// Values by the name of what was measured: names ascending, the values of one in the order in which they were found.
+// Values by the name of the measurement: names ascending, the values of one name in the order of measurement.
 using TraceResults = std::map<std::string, std::vector<std::uint64_t>>;
 
 // One thread at a time.
 class Trace {
 public:
-    // Only a trace that collects kernel events is run through the kernel event trace service.
+    // Only a trace that collects kernel events uses the kernel event trace service.
     Trace(std::string name, bool collectKernelTrace) : name_(std::move(name)), collectKernelTrace_(collectKernelTrace)
     {
     }
@@ -22,15 +22,15 @@ public:
     [[nodiscard]] const std::vector<std::unique_ptr<TraceData>>& data() const { return data_; }
 
     void addTraceDataToCollect(std::unique_ptr<TraceInterval> interval) { data_.push_back(std::move(interval)); }
-    // Lets each of them, in their order, read all events. Those that are left when there are so many results, or when
-    // all together have read so many events (a second or so of work, for which the service waits), do not, with a line
-    // that says how many; the first always does.
+    // Lets each measurement, in order, read all events. It stops after this many results, or after this many events
+    // were read by all together (about a second of work, for which the service waits), and logs how many measurements
+    // are left out. The first measurement always runs.
     static constexpr std::size_t mostResults = 1'000'000;
     static constexpr std::size_t mostEventsRead = 50'000'000;
     void processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events);
-    // How many were left out.
+    // How many measurements were left out.
     [[nodiscard]] std::size_t intervalsLeftOut() const { return intervalsLeftOut_; }
-    // Everything that was found. What one call has gathered stays: the next returns every value once more.
+    // All results so far. The collected values stay: each further call adds all values once more.
     [[nodiscard]] TraceResults getResults();
 
 private:

@@ -1,4 +1,4 @@
-// The average, in the precision that its readers know.
+// The average, in single precision, as its callers expect.
 #include "tracing/TraceData.h"
 
 float TraceData::getAverageResult() const

@@ -1,4 +1,4 @@
-// The budget is asked only when a list grows, so that keeping an event costs no more than copying it.
+// The budget is used only when a list grows, so that keeping an event costs no more than copying it.
 #include "tracing/TraceEvents.h"
 
 #include <algorithm>
@@ -6,7 +6,7 @@
 
 namespace {
 
-constinit std::atomic<std::size_t> room{TraceEvents::mostOfAllTraces}; // that nobody has taken
+constinit std::atomic<std::size_t> room{TraceEvents::mostOfAllTraces}; // that no trace has taken
 
 std::size_t takeRoom(std::size_t wanted)
 {

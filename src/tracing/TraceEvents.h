@@ -1,7 +1,7 @@
 // The events of one trace while it runs, in memory that all traces share.
 //
-// Whoever emits events decides how many there are. So beyond a first room, which every trace has, memory comes from one
-// budget of the process; when that is used up, events are lost and counted.
+// Clients decide how many events come. So every trace has a first room, and further memory comes from one budget of the
+// process; when that is used up, events are lost and counted.
 #pragma once
 
 #include "tracing/TraceData.h"
@@ -29,7 +29,7 @@ public:
     }
 
     [[nodiscard]] std::span<const trace_point> all() const { return events_; }
-    // How many there was no room for.
+    // How many events were lost because there was no room.
     [[nodiscard]] std::uint64_t lost() const { return lost_; }
 
 private:

@@ -1,7 +1,7 @@
-// Pairing, in one pass over the events. Of each thread only the last start has to be remembered.
+// Pairs events in one pass. Only the last start of each thread is kept.
 //
-// Events are large and many, so that it is memory that the time goes to: asking for events before their turn, and for
-// the results' memory at once, make pairing some 1.2 and 1.3 times as fast.
+// Events are large and many, so memory access takes most of the time: prefetching events makes pairing some 1.2 times
+// as fast, and reserving the results' memory at once some 1.3 times.
 #include "tracing/TraceInterval.h"
 
 #include "utility/KestoReportingLogCategories.h"
@@ -10,22 +10,22 @@ namespace {
 
 constexpr std::string_view startsDiscarded =
     "DISCARDED {} trace Start points for interval {} because no stop points found";
-// Says how many starts were discarded, too: readers of the log know these lines as they are.
+// The line reports the number of discarded starts, too: programs that read the log rely on its text.
 constexpr std::string_view stopsDiscarded =
     "DISCARDED {} trace Stop points for interval {} because no start points found";
 
-// The last start of each thread that had one. An open-addressed table from which nothing is removed: a thread keeps its
-// place, which its next start is likely to need again.
+// The last start of each thread. An open-addressed table without removal: a thread keeps its place, because its next
+// start is likely to need it again.
 class StartsByThread {
 public:
     struct Start {
         std::uint64_t thread = 0;
         std::uint64_t timestamp = 0;
         bool isPending = false;
-        bool isTaken = false; // the place, by that thread
+        bool isTaken = false; // by that thread
     };
 
-    // The thread's place, as long as no other is taken.
+    // The thread's place, if it is the only thread so far.
     Start& take(std::uint64_t thread)
     {
         if (2 * taken_ >= places_.size())
@@ -39,10 +39,10 @@ public:
         return start;
     }
 
-    // The thread's place or, if it has none, one that nobody has taken.
+    // The thread's place or, if it has none, a free one.
     Start& find(std::uint64_t thread)
     {
-        constexpr std::uint64_t spread = 0x9E3779B97F4A7C15; // neighbours end far apart
+        constexpr std::uint64_t spread = 0x9E3779B97F4A7C15; // neighbouring numbers get distant places
         std::size_t at = thread * spread >> (64 - placesLog2_);
         while (places_[at].isTaken && places_[at].thread != thread)
             at = (at + 1) & (places_.size() - 1);
@@ -65,7 +65,7 @@ private:
     std::size_t taken_ = 0;
 };
 
-// Asks for the event whose turn is soon.
+// Prefetches an event that will be read soon.
 inline void prefetchBehind(const trace_point& event, std::span<const trace_point> events)
 {
     constexpr std::ptrdiff_t ahead = 24;
@@ -77,7 +77,7 @@ inline void prefetchBehind(const trace_point& event, std::span<const trace_point
 
 void TraceInterval::processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events)
 {
-    makeRoom(events.size() / 2); // no more can come of them
+    makeRoom(events.size() / 2); // the greatest possible number of results
     if (matchByThread_)
         processTracepointsSingleThread(session, events);
     else

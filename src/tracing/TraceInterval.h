@@ -1,4 +1,4 @@
-// The time from an event of one code to the next event of another: on the same thread, or on whichever.
+// The time from an event of one code to the next event of another: on the same thread, or on any thread.
 //
 // A start that is followed by another start, and a stop without a start, are discarded and counted. An event whose code
 // begins and ends the interval begins it.
@@ -25,7 +25,7 @@ public:
     void processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events) override;
     virtual void processTracepointsSingleThread(const platform::KernelTraceSession& session,
                                                 std::span<const trace_point> events);
-    // A start at time 0 counts as none.
+    // A start at time 0 does not count.
     virtual void processTracepointsAnyThread(const platform::KernelTraceSession& session,
                                              std::span<const trace_point> events);
 

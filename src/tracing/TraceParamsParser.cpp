@@ -1,8 +1,7 @@
-// Every nested value is taken for what it should be, and for an empty one when it is not: that is how the reading goes
-// on behind a failure.
+// A nested value of a wrong kind counts as empty, so that reading goes on after a failure.
 //
-// The codes and the type of a point are kept for the points behind it, which override only what they have: a level,
-// which names no end, ends with the event of the interval before it.
+// The codes and the type of a point are kept for the next points, which override only the values that they have: a
+// level, which has no end code, ends with the event of the interval before it.
 #include "tracing/TraceParamsParser.h"
 
 #include "foundation/plist/PropertyList.h"
@@ -23,7 +22,7 @@ using foundation::Dictionary;
 using foundation::PropertyListLimits;
 using foundation::Value;
 
-// The value, or what is wrong with it.
+// The value, or the text of its error.
 template <typename Kind> using Expected = std::expected<Kind, std::string>;
 
 std::string_view nameOf(Value::Kind kind)
@@ -62,7 +61,7 @@ Expected<Dictionary> asDictionary(const Value& value)
     return std::unexpected(foundation::format("it is {}, not a dictionary", nameOf(value.kind())));
 }
 
-// The value as text; no text when it is missing.
+// The value as text; empty if it is missing.
 std::string textAt(const Dictionary& dictionary, std::string_view key)
 {
     const Value value = valueAt(dictionary, key);
@@ -77,7 +76,8 @@ std::string cStringAt(const Dictionary& dictionary, std::string_view key)
     return text;
 }
 
-// The number that the text begins with, behind blanks and "0x": 0 when there is none, the greatest when it is greater.
+// The number at the start of the text, behind blanks and "0x": 0 if it is missing, the greatest number if it is out of
+// range.
 std::uint32_t scanHexadecimal(std::string_view text)
 {
     text.remove_prefix(std::min(text.find_first_not_of(" \t\n\v\f\r"), text.size()));
@@ -132,7 +132,7 @@ private:
         fail(foundation::format("Reading from plist file failed with error: {}", why));
     }
 
-    // Of several problems the first is the one that explains the others.
+    // Keeps only the first problem, which usually explains the others.
     void fail(std::string problem)
     {
         KESTO_LOG(KestoReportingTraceCategory(), Error, "{}", problem);
@@ -201,7 +201,7 @@ private:
                   static_cast<std::int32_t>(begin_), static_cast<std::int32_t>(end_));
     }
 
-    // Whether it is a type.
+    // Whether the point's type is known.
     bool takeTypeAndCodes(const Dictionary& point)
     {
         const std::string type = textAt(point, TracePointType);
@@ -233,7 +233,7 @@ private:
 
 std::unique_ptr<TraceParams> TraceParamsParser::loadTraceParams() const
 {
-    std::error_code unknown; // where the current directory is gone, nothing is found below it
+    std::error_code unknown; // without a current directory the file is not found
     return Loading().load(std::filesystem::current_path(unknown) / traceParamsFile_);
 }
 

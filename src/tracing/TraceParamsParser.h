@@ -1,7 +1,7 @@
 // Reads the trace-parameters file that a session's configuration names.
 //
-// A client names the file, so that it may be anything: missing, a pipe, a gigabyte, no property list, or one of the
-// wrong shape. Nothing of that ends the reading: what is wrong is logged and counts as empty, and the rest is read.
+// A client names the file, so it may be missing, a pipe, a gigabyte large, not a property list, or one of the wrong
+// structure. The parser logs each error, treats the wrong part as empty, and reads the rest.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -15,18 +15,18 @@
 // One thread at a time.
 class TraceParamsParser {
 public:
-    // The path; one that does not begin with "/" is taken from the process's current directory.
+    // A relative path starts at the process's current directory.
     explicit TraceParamsParser(std::string fileName) : traceParamsFile_(std::move(fileName)) { }
 
     [[nodiscard]] const std::string& traceParamsFile() const { return traceParamsFile_; }
 
-    // What the file says, never null: without name and points when it says nothing. Does not wait for whatever stands
-    // at the path, and takes no more memory than a file within the limits of property lists.
+    // The content of the file, never null: without name and points if it holds none. Does not wait for a pipe or
+    // device, and takes no more memory than a file within the limits of property lists.
     [[nodiscard]] std::unique_ptr<TraceParams> loadTraceParams() const;
-    // What a property list says that was read already. Any thread; needs no platform, without which it logs nothing.
+    // The content of a property list that was read before. Any thread. Works without a platform, but then does not log.
     [[nodiscard]] static std::unique_ptr<TraceParams> paramsOf(const foundation::Value& root);
 
-    // Traces and points of a file, taken together. Those beyond are left out, with a line that says how many.
+    // The limit of traces and points together. Further ones are left out, and a log line gives their number.
     static constexpr std::size_t mostTracesAndPoints = 1024;
 
 private:

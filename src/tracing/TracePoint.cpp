@@ -1,4 +1,4 @@
-// One argument of each event of the code.
+// Reads one argument of each event of the code.
 #include "tracing/TracePoint.h"
 
 void TracePoint::processTracepoints(const platform::KernelTraceSession&, std::span<const trace_point> events)

@@ -1,4 +1,4 @@
-// A trace's way: set up, started, ended, completed.
+// The life of a trace: set up, started, ended, completed.
 #include "tracing/TraceRunner.h"
 
 #include "foundation/text/Format.h"
@@ -67,7 +67,7 @@ void TraceRunner::setupTracing(Trace& trace)
 {
     auto session = platform::current().kernelTrace.createTraceSession();
     if (!session) {
-        fail(foundation::format("there is no kernel trace; {} collects no events", trace.name()));
+        fail(foundation::format("the kernel trace is not available; {} collects no events", trace.name()));
         return;
     }
     session->setCompletionHandler([this, &trace] { tracingCompletionHandler(trace); });
@@ -124,7 +124,7 @@ void TraceRunner::stopTracing(Trace& trace)
     if (const auto session = traceSessions_.find(&trace); session != traceSessions_.end())
         session->second->end();
     else
-        tracingCompletionHandler(trace); // nobody else would
+        tracingCompletionHandler(trace); // no session will call it
 }
 
 void TraceRunner::tracingCompletionHandler(Trace& trace)

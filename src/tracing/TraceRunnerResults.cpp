@@ -26,7 +26,7 @@ void TraceRunner::writeQuilldat()
     perfWriter_ = platform::current().performanceWriter.open(directory / resultsFileName, projectName, resultsVersion_);
     if (!perfWriter_) {
         KESTO_LOG(KestoReportingTraceCategory(), Info, "Failed to open quilldat writer");
-        std::_Exit(exitStatus); // at once: other threads are at work, and what was acknowledged is kept already
+        std::_Exit(exitStatus); // at once, because other threads are running; acknowledged events are kept already
     }
     for (const auto& traceWithResults : traceResults_) {
         printTraceResults(traceWithResults);
@@ -38,7 +38,7 @@ void TraceRunner::writeQuilldat()
     perfWriter_.reset();
 }
 
-// Whoever reads the file looks here before believing what is in it.
+// Readers of the file check these remarks before they rely on its records.
 void TraceRunner::remarkWhatIsMissing()
 {
     perfWriter_->remark("lostEvents", lostEvents_);

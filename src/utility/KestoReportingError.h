@@ -1,4 +1,4 @@
-// The one error that a client can be answered with, and the callbacks that carry answers.
+// The one error in answers to clients, and the callbacks that carry answers.
 #pragma once
 
 #include "platform/Turn.h"
@@ -8,7 +8,7 @@
 #include <optional>
 #include <string_view>
 
-// A domain and a code, and nothing more.
+// A domain and a code.
 struct KestoReportingError {
     std::string_view domain; // a constant of the program
     std::int64_t code = 0;

@@ -1,4 +1,4 @@
-// The log categories of the service, one a subject, so that a reader of the log can follow one of them.
+// The log categories of the service, one for each subject, so that a reader of the log can follow one subject.
 //
 // Constant globals behind accessors: a disabled log statement costs a load and a branch.
 #pragma once
@@ -36,7 +36,7 @@ inline platform::LogCategory& KestoReportingSessionCategory()
     return KestoReportingLog::session;
 }
 
-// What sessions derive from their messages.
+// Values that sessions derive from their messages.
 inline platform::LogCategory& KestoReportingSessionBlinReportingCategory()
 {
     return KestoReportingLog::sessionBlinReporting;

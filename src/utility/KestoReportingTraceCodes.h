@@ -1,5 +1,5 @@
-// The codes of the markers that the service leaves in the kernel's trace, so that its own work can be seen
-// between the events of drivers and clients.
+// The codes of the service's own markers in the kernel's trace, which show its work between the events of drivers and
+// clients.
 #pragma once
 
 #include "platform/Platform.h"
@@ -21,7 +21,7 @@ enum class KestoReportingTraceCode : std::uint32_t {
     SessionMessageAccepted = 0x21044838,
 };
 
-// Leaves the marker, with four zero arguments. Any thread.
+// Emits the marker, with four zero arguments. Any thread.
 inline void KestoReportingEmitTracePoint(KestoReportingTraceCode code)
 {
     platform::current().traceMarkers.emit(static_cast<std::uint32_t>(code), {});

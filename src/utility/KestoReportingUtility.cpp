@@ -16,10 +16,10 @@
 
 namespace {
 
-// Of a wait that begins now.
+// The deadline of a wait that begins now.
 std::chrono::steady_clock::time_point deadline(double timeout)
 {
-    constexpr double longest = 1e9; // seconds; some thirty years, which every clock can hold
+    constexpr double longest = 1e9; // seconds; some thirty years, which fits in every clock
     const std::chrono::duration<double> bounded(std::fmax(0, std::fmin(timeout, longest)));
     return std::chrono::steady_clock::now() + std::chrono::duration_cast<std::chrono::nanoseconds>(bounded);
 }
@@ -51,7 +51,7 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 
 bool KestoReportingUtilityIsInternalBuild()
 {
-    // The number of the platform's installation that was asked, and below it the answer's bit.
+    // The number of the installed platform for which the answer holds, and in the lowest bit the answer.
     static std::atomic<std::uint64_t> remembered;
     const std::uint64_t installation = platform::installationNumber();
     const auto isRemembered = [&] { return remembered.load(std::memory_order_relaxed) >> 1 == installation; };
@@ -155,8 +155,8 @@ foundation::Dictionary KestoReportingUtilityRemoveWhiteSpaceFromKeys(const found
 
 namespace {
 
-// What becomes of the messages of one shape when they are normalised: which of their values stay, and the shape that
-// these have then with the tag behind them.
+// How messages of one shape are normalised: which of their values stay, and the shape of these values with the tag
+// behind them.
 struct NormalisedShape {
     foundation::Reference<foundation::DictionaryShape> of;
     bool keepsTime = false;
@@ -164,7 +164,7 @@ struct NormalisedShape {
     foundation::Reference<foundation::DictionaryShape> shape;
 };
 
-// A thread remembers the last ones: those of a session are nearly always of a shape that was there before.
+// Each thread caches the last shapes: a session's messages nearly always repeat an earlier shape.
 NormalisedShape& rememberedShape(const foundation::DictionaryShape* of)
 {
     constexpr std::size_t remembered = 16;
@@ -172,7 +172,7 @@ NormalisedShape& rememberedShape(const foundation::DictionaryShape* of)
     return recent[std::hash<const void*>()(of) / alignof(std::max_align_t) % remembered];
 }
 
-// Remembers what became of the message's shape, unless keys fell together or there are many of them.
+// Caches how the message's shape was normalised, unless keys became equal or there are many keys.
 foundation::Dictionary normaliseAnew(const foundation::Dictionary& message, const foundation::DictionaryEntry& tag,
                                      bool keepsTime, NormalisedShape& remembered)
 {

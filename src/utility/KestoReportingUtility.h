@@ -1,5 +1,5 @@
-// Functions that the service, its clients, its sessions and its sinks share: waiting, process names,
-// payload normalisation, bucketing. None keeps state but for the build kind, which is asked for once.
+// Functions that the service, its clients, its sessions and its sinks share: waiting, process names, payload
+// normalisation, bucketing. They keep no state except the build kind, which is read once.
 //
 // All of them may be called from any thread.
 #pragma once
@@ -28,9 +28,8 @@ struct KestoReportingCondition {
     foundation::Condition signal;
 };
 
-// Waits until the other side has set the flag. Each wait without a signal lasts `timeout` seconds at most (not at all
-// when it is negative, as good as for ever when it is no number); a wake-up without the flag begins a new one. False
-// when one of them timed out.
+// Waits until another thread has set the flag. Each wait lasts at most `timeout` seconds (0 for a negative number,
+// practically for ever for NaN); a wake-up without the flag begins a new wait. False if a wait timed out.
 bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeout, const bool& flag,
                                std::string_view waitMessage, std::string_view timeoutMessage,
                                platform::LogCategory& logCategory);
@@ -42,10 +41,10 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 
 // The short name of that process; nothing for numbers below 1 and for processes that do not exist.
 [[nodiscard]] std::optional<std::string> KestoReportingUtilityProcessNameForPID(std::int32_t pid);
-// Fills `entry` and returns true when there is such a process.
+// Fills `entry` and returns true if the process exists.
 [[nodiscard]] bool KestoReportingUtilityProcessInfoForPID(std::int32_t pid, platform::ProcessTableEntry& entry);
 
-// What the dictionary holds as the host application, or "Unknown".
+// The host application in the dictionary, or "Unknown".
 [[nodiscard]] foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Dictionary& dictionary);
 
 // The next three are the definition of what is done to a message; sessions call the one behind them, which the property
@@ -55,7 +54,7 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 [[nodiscard]] foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation::Dictionary& message,
                                                                              AudioEventCategory category,
                                                                              AudioEventType type);
-// The payload without its time stamp, but as it is on internal builds: only those may keep it.
+// The payload without its time stamp; on internal builds, which may keep it, the unchanged payload.
 [[nodiscard]] foundation::Dictionary KestoReportingUtilityRemoveEventEpochTime(const foundation::Dictionary& message);
 // The payload with "_" for every blank in its keys; of keys that become equal the last one's value stays.
 [[nodiscard]] foundation::Dictionary
@@ -77,9 +76,9 @@ constexpr std::array<double, 17> KestoReportingUtilityBucketNumberToStringVolume
     0.0,    0.0625, 0.125,  0.1875, 0.25,   0.3125, 0.375,  0.4375, 0.5,
     0.5625, 0.625,  0.6875, 0.75,   0.8125, 0.875,  0.9375, 1.0};
 
-// The text of the bucket nearest to the number, the later one of two that are equally near: the walk stops at
-// the first bucket that is farther away than the one before. Nothing when there are no buckets. With `places`
-// fraction digits at most, and one at least unless `places` is 0.
+// The text of the bucket nearest to the number, the later of two that are equally near: the search stops at the first
+// bucket that is farther away than the one before. Nothing without buckets. At most `places` fraction digits, and at
+// least one unless `places` is 0.
 [[nodiscard]] std::optional<std::string>
 KestoReportingUtilityBucketNumberToString(double number, std::span<const double> buckets, unsigned places);
 

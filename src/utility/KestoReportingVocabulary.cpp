@@ -1,4 +1,4 @@
-// The tables behind the names. A name's place in its table is its number.
+// The tables of the names. A name's index in its table is its number.
 #include "utility/KestoReportingVocabulary.h"
 
 #include <algorithm>

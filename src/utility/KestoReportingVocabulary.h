@@ -1,8 +1,8 @@
-// What a message is about: the event categories, event types and service types, with their names and the
-// small policies that hang on them.
+// The kinds of messages: event categories, event types and service types, with their names and the small policies that
+// depend on them.
 //
-// Clients and stored events speak in these numbers and names, so none of them ever changes.
-// Everything here is a pure function of its argument. Any thread.
+// Clients and stored events use these numbers and names, so they never change. Everything here is a pure function of
+// its argument. Any thread.
 #pragma once
 
 #include <cstdint>
@@ -28,16 +28,16 @@ constexpr AudioServiceType AudioServiceTypeStandalone = 5;
 constexpr AudioServiceType AudioServiceTypeTest = 11;
 constexpr AudioServiceType AudioServiceTypeUnknown = 65535;
 
-// "Playback"; with a group "DSP_Playback"; with a group that has no name "_Playback".
+// "Playback"; with a group "DSP_Playback"; with a group without a name "_Playback".
 [[nodiscard]] std::string KestoReportingUtilityCategoryString(AudioEventCategory category);
 [[nodiscard]] std::string_view KestoReportingUtilityTypeString(AudioEventType type);
 
-// The name of a service type; what is above 13 counts as "telephony", but for 65535, which is "unknown".
+// The name of a service type; numbers above 13 count as "telephony", except 65535, which is "unknown".
 [[nodiscard]] std::string_view KestoReportingUtilityGenerateServiceNameFromServiceType(AudioServiceType type);
 // The service type of exactly that name, or 65535.
 [[nodiscard]] AudioServiceType KestoReportingUtilityGenerateServiceTypeFromServiceName(std::string_view name);
 
-// Every service type is batched but for "apiusage".
+// Every service type except "apiusage" is batched.
 [[nodiscard]] bool KestoReportingUtilityShouldBatchBlinReportingEventsForServiceType(AudioServiceType type);
 // Whether the category carries a group.
 [[nodiscard]] bool KestoReportingUtilityIsABTestModeOn(AudioEventCategory category);

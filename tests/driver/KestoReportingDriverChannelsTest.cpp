@@ -1,5 +1,5 @@
-// Driver logs of channels that are really published, as files: all of a session's road from the file to the event, with
-// everything that files may do in between.
+// Driver logs of channels that are published as files: the whole path from the file to the event, with all changes of
+// files in between.
 #include "driver/KestoReportingDriverUtility.h"
 #include "platform/linux/channels/LinuxReportingChannels.h"
 #include "support/ExchangedProviders.h"
@@ -33,7 +33,7 @@ protected:
         fs::create_directories((root / place).parent_path());
         support::replaceFile(root / place, text);
     }
-    // The service starts with what is published so far, and a session begins.
+    // The service starts with the present channels, and a session begins.
     void begin()
     {
         utility.emplace();

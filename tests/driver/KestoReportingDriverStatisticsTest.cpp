@@ -1,4 +1,4 @@
-// How the drivers' channels changed over a session, put into words, and who is told.
+// How the drivers' channels changed during a session, as text, and the receivers of the text.
 #include "driver/KestoReportingDriverUtility.h"
 #include "support/TestPlatform.h"
 
@@ -58,7 +58,7 @@ ReportingChannel states(std::vector<platform::StateResidency> given)
 using DriverStats = KestoReportingDriverUtility::DriverStats;
 using Process = void (*)(const ReportingChannel&, DriverStats&);
 
-// What is said of one channel; nothing when nothing is.
+// The text of one channel; nothing if it is left out.
 std::optional<Value> said(Process process, const ReportingChannel& channel)
 {
     DriverStats stats;
@@ -184,7 +184,7 @@ TEST(HistogramData, ReportsABucketOfWhichHitsWentDown)
               Value("count=1,lower=0,upper=1,min=3,max=37,unit=ms::0-1:-4"));
 }
 
-TEST(HistogramData, GoesOnWithWhateverBoundsWereRead)
+TEST(HistogramData, GoesOnWithTheBoundsThatWereRead)
 {
     const support::TestPlatform platform;
     EXPECT_EQ(said(processHistogramData,
@@ -254,7 +254,7 @@ protected:
     }
 
     void publish(ReportingChannel channel) { platform.reportingChannels.publish(std::move(channel)); }
-    // The service starts with what is published so far, and the session takes its snapshot.
+    // The service starts with the present channels, and the session takes its snapshot.
     void begin()
     {
         utility.emplace();
@@ -267,7 +267,7 @@ protected:
         platform.analytics.clear();
         platform.log.clear();
     }
-    // What the session was told, as "identifier: payload".
+    // The session's messages, as "identifier: payload".
     std::vector<std::string> end()
     {
         utility->sendDriverLogsForSession(platform.turn, session);

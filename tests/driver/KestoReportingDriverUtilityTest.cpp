@@ -87,7 +87,7 @@ TEST_F(DriverUtility, SubscribesToEveryDriverThatPublishes)
     }
 }
 
-// --- what subscribing says
+// --- the log of subscriptions
 
 TEST_F(DriverUtility, SaysOnceThatADriverHasNoChannelsAndNothingLater)
 {

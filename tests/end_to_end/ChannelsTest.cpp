@@ -1,4 +1,4 @@
-// What a driver helper publishes with libkesto, up to the stored event that tells how it changed over a session.
+// Channels that a driver helper publishes with libkesto, up to the stored event with their change during a session.
 #include "kesto/channels.hpp"
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
@@ -91,7 +91,7 @@ TEST_F(ChannelsTest, AHostileTreeCostsItsFilesAndNothingElse)
         EXPECT_EQ(kestod.countInLog("channel hostile/Tx/-/" + std::string(name) + " is left out"), 1U) << name;
 }
 
-// A driver "dock" of a process of its own, with what it counts and the state that it is in.
+// A driver "dock" in a process of its own, with its counter and its state.
 class KilledDriverTest : public testing::Test {
 protected:
     [[nodiscard]] support::Victim dock(const std::string& device) const
@@ -111,7 +111,7 @@ protected:
             return isRight && publisher.flush() == kesto::Status::Ok;
         });
     }
-    // What all events of sessions tell of drivers.
+    // The drivers' statistics in all events of sessions.
     [[nodiscard]] std::string told()
     {
         std::string text;

@@ -1,5 +1,5 @@
-// The process gets an environment of its own, nothing of the test's but what sanitizers need, and ends with SIGKILL:
-// what it promises must hold for whoever pulls the plug. What it stored is read as anyone may read it, by SQL.
+// The process gets an environment of its own, with only the sanitizers' variables from the test, and ends with SIGKILL,
+// because its guarantees must hold even then. The tests read its store by SQL, as any user may.
 #include "end_to_end/Kestod.h"
 
 #include "end_to_end/WireClient.h"
@@ -93,7 +93,7 @@ void Kestod::start(const InheritedDescriptors& inherited)
             char* digits = variables.back().data() + passedTo.size();
             std::to_chars(digits, digits + longestPID, ::getpid());
         }
-        ::signal(SIGPIPE, SIG_DFL); // as a shell starts it, whoever started the test
+        ::signal(SIGPIPE, SIG_DFL); // as in a shell; the test may have inherited another setting
         char name[] = "kestod";
         char* arguments[] = {name, nullptr};
         ::execve(KESTOD_PATH, arguments, pointers.data());

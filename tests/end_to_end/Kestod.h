@@ -17,10 +17,10 @@
 
 namespace end_to_end {
 
-// How long a test waits for something that must happen.
+// How long a test waits before it fails.
 constexpr std::chrono::seconds patience(30);
 
-// Waits until the condition holds; false when it does not come to.
+// Waits until the condition holds; false if the time is over.
 template <typename Condition> bool waitUntil(Condition condition)
 {
     const auto end = std::chrono::steady_clock::now() + patience;
@@ -38,7 +38,7 @@ struct StoredEvent {
     std::string payload; // JSON
 };
 
-// Descriptors that the process is given in place of its own; -1: none.
+// Descriptors that replace the process's own; -1: none.
 struct InheritedDescriptors {
     int standardError = -1; // in place of the log file
     int listeningSocket = -1; // passed as a service manager passes it
@@ -51,15 +51,15 @@ public:
     // Files of the configuration directory by name, such as "device.toml".
     using Files = std::map<std::string, std::string>;
 
-    // Makes the directories and the files; starts nothing. Further variables come on top of the usual ones; one that
-    // is empty is not set at all.
+    // Makes the directories and the files, and does not start the process. Adds further variables to the usual ones; an
+    // empty one is not set.
     explicit Kestod(const Files& configuration = {}, Environment further = {});
     ~Kestod();
     Kestod(const Kestod&) = delete;
     Kestod& operator=(const Kestod&) = delete;
 
-    // From the next start on the process finds this folder empty, as a unit with PrivateTmp= or ProtectHome= has it
-    // find others'. Takes a right to mount.
+    // From the next start on the process sees this folder empty, as under a unit with PrivateTmp= or ProtectHome=.
+    // Needs the right to mount.
     void hide(const std::filesystem::path& folder) { hidden_ = folder; }
 
     // Starts the process; clients that connect at once wait for it.
@@ -74,15 +74,15 @@ public:
     [[nodiscard]] pid_t process() const { return process_; }
     [[nodiscard]] const std::filesystem::path& directory() const { return directory_.path(); }
     [[nodiscard]] std::filesystem::path socketPath() const { return directory() / "run" / "kesto.socket"; }
-    // What the process wrote on standard error so far.
+    // The process's standard error so far.
     [[nodiscard]] std::string log() const;
-    // Waits until the log holds the text; false when it does not come.
+    // Waits until the log holds the text; false if the time is over.
     [[nodiscard]] bool waitForLog(std::string_view text) const;
     [[nodiscard]] std::size_t countInLog(std::string_view text) const;
 
     // The stored events of names that match the pattern (GLOB), in order. Throws when the store cannot be read.
     [[nodiscard]] std::vector<StoredEvent> events(std::string_view pattern = "*") const;
-    // Waits until there is such an event.
+    // Waits for such an event.
     [[nodiscard]] std::vector<StoredEvent> waitForEvents(std::string_view pattern) const;
 
 private:

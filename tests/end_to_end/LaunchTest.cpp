@@ -1,4 +1,4 @@
-// Starting: where the socket comes from, what is said when there is none, and when the service is ready.
+// Starting: the source of the socket, the error without one, and the notification of readiness.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 
@@ -110,7 +110,7 @@ TEST_F(PassedSocketTest, NeedsNoNameAndNoRuntimeDirectory)
     EXPECT_EQ(WireClient(path).ask(GetAllReporters), (foundation::Array{1, foundation::Value(), foundation::Array{}}));
 }
 
-TEST_F(PassedSocketTest, WithoutARuntimeDirectoryPreferencesAreToldAllTheSame)
+TEST_F(PassedSocketTest, WithoutARuntimeDirectoryPreferencesAreReportedAllTheSame)
 {
     WireClient(path).ask(GetAllReporters); // its notifications are registered
     std::filesystem::create_directory(kestod.directory() / "configuration/preferences");
@@ -119,7 +119,7 @@ TEST_F(PassedSocketTest, WithoutARuntimeDirectoryPreferencesAreToldAllTheSame)
     EXPECT_TRUE(kestod.waitForLog(R"(defaults {"device_name":"a",)"));
 }
 
-TEST(LaunchTest, GoesOnWhenNobodyReadsItsLogAnyMore)
+TEST(LaunchTest, GoesOnWhenItsLogHasNoReaderAnyMore)
 {
     int ends[2] = {};
     ASSERT_EQ(::pipe2(ends, O_CLOEXEC), 0);
@@ -153,7 +153,7 @@ TEST(LaunchTest, BrokenConfigurationIsSaidAndTheServiceRunsWithoutIt)
         EXPECT_TRUE(kestod.waitForLog(file)) << file;
 }
 
-TEST(LaunchTest, ADatabaseThatIsNoneIsPutAsideAndAnotherBegun)
+TEST(LaunchTest, AFileThatIsNotADatabaseIsPutAsideAndAnotherBegun)
 {
     Kestod kestod({}, {{"KESTO_LOG", "default"}});
     support::writeFile(kestod.directory() / "state/analytics.sqlite3", std::string(10'000, 'x'));

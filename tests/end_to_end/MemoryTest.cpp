@@ -27,10 +27,10 @@ protected:
         KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
         kestod.start();
         client.emplace(kestod.socketPath());
-        play(1, 100); // whatever is there from the first session on
+        play(1, 100); // allocates the memory that stays from the first session on
     }
 
-    // "VmRSS", or "VmHWM" for the most since `forgetMostMemory`.
+    // "VmRSS", or "VmHWM" for the maximum since `forgetMostMemory`.
     [[nodiscard]] double megabytes(std::string_view what) const
     {
         std::ifstream status("/proc/" + std::to_string(kestod.process()) + "/status");
@@ -45,7 +45,7 @@ protected:
     // Begins a session and sends so many messages, each with another volume.
     void play(int reporter, int count)
     {
-        constexpr int unanswered = 4000; // more than a thread that helps would do
+        constexpr int unanswered = 4000; // more than a helping thread would run
         client->ask(Create, reporter);
         client->call(Start, reporter);
         for (int number = 0; number <= count; ++number) {

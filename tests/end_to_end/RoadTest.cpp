@@ -1,4 +1,4 @@
-// The whole road, from a client's call to a stored event, through a real service.
+// The whole path, from a client's call to a stored event, through a real service.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 
@@ -75,7 +75,7 @@ TEST_F(RoadTest, WhatIsAcknowledgedIsKeptWhenTheServiceIsKilled)
         ++acknowledged;
     }
     kestod.kill();
-    while (client.nextReply()) // those that had left already
+    while (client.nextReply()) // replies that had left already
         ++acknowledged;
     EXPECT_GE(kestod.events("com.quarn.kesto.*").size(), static_cast<std::size_t>(acknowledged));
 }
@@ -228,19 +228,19 @@ TEST_F(RoadTest, AResetIsAnInterruptionAndThenAnInvalidationAndStopsSessionsOnce
     EXPECT_THAT(kestod.waitForEvents(uptimeEvent), SizeIs(1));
 }
 
-// A connection may be over before the server queue, which is busy with others, comes to register it. It then has no
-// uptime yet, and the log says so; it is registered and removed all the same.
+// A connection may end before the busy server queue registers it. It then has no uptime yet, which is logged; it is
+// registered and removed all the same.
 TEST(CrowdedRoadTest, EveryConnectionThatComesAndVanishesBesideABusyClientIsRegisteredAndRemoved)
 {
     constexpr std::size_t connections = 10'000;
     Kestod kestod({}, {{"KESTO_LOG", "default"}});
-    kestod.startAndAwait(); // with a first connection, which is gone at once
+    kestod.startAndAwait(); // with a first connection, which ends at once
     std::jthread busy([&](const std::stop_token& isOver) {
         WireClient client(kestod.socketPath());
         client.ask(Create, 1);
         client.call(Start, 1);
         while (!isOver.stop_requested()) {
-            constexpr int burst = 5'000; // more than the connection thread works off itself
+            constexpr int burst = 5'000; // more than the connection thread runs itself
             client.sendFrame(Array{0, static_cast<int>(Validate), 1}, burst);
             for (int number = 0; number < burst; ++number)
                 ASSERT_TRUE(client.nextReply());
@@ -335,7 +335,7 @@ TEST(CustomerRoadTest, EventsKeepTheTimeStampThatRecordedMessagesLose)
     EXPECT_FALSE(std::filesystem::exists(kestod.directory() / "logs/Audio"));
 }
 
-TEST(UnwantedRoadTest, NothingIsStoredWhoseNameNobodyWants)
+TEST(UnwantedRoadTest, EventsWithUnwantedNamesAreNotStored)
 {
     Kestod kestod(Kestod::Files{{"analytics.toml", "used = [\"com.quarn.alerts.*\"]\n"}});
     kestod.start();
@@ -347,7 +347,7 @@ TEST(UnwantedRoadTest, NothingIsStoredWhoseNameNobodyWants)
     };
     sendAlert();
     ASSERT_TRUE(kestod.waitForLog("invalidationHandler: connection exited"));
-    sendAlert(); // what the end of the first was worth is stored before this, or never
+    sendAlert(); // the events of the first session's end are stored before this, or never
     EXPECT_THAT(kestod.events(),
                 ElementsAre(named("com.quarn.alerts.Playback.Start"), named("com.quarn.alerts.Playback.Start")));
 }

@@ -1,5 +1,5 @@
-// A real kernel trace: what a program emits from several threads, the service measures, and the program's own clock
-// says the same.
+// A real kernel trace: the service measures the events that a program emits from several threads, and the program's own
+// clock agrees.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 #include "kesto/trace/TraceResultsFile.h"
@@ -60,7 +60,7 @@ std::string parameters()
         + points + "</array></dict></array></dict></plist>";
 }
 
-// What an interval cannot be shorter or longer than, by the clock of who emits it: in nanoseconds.
+// Bounds of an interval's length by the emitter's clock, in nanoseconds.
 struct Bounds {
     double least;
     double most;
@@ -83,13 +83,13 @@ Bounds emitInterval(const kesto::Tracer& tracer, std::uint32_t begin, std::uint3
     return {.least = nanoseconds(beforeEnd - afterBegin), .most = nanoseconds(afterEnd - beforeBegin)};
 }
 
-// Of one thread, in the order of time: each interval of its own, and then one of the codes that all share.
+// The intervals of one thread, in the order of time: each its own, and then one with the shared codes.
 struct Emitted {
     std::vector<Bounds> own;
     std::vector<Bounds> shared;
 };
 
-// Every length is another one, so that no interval can be taken for another.
+// All lengths differ, so that intervals cannot be confused.
 Emitted emitIntervals(const kesto::Tracer& tracer, unsigned thread)
 {
     Emitted emitted;
@@ -129,7 +129,7 @@ protected:
                      reporter);
         return start();
     }
-    // Where there is a trace, a start is answered at once, and once more at the stop.
+    // If the service traces, a start is answered at once, and again at the stop.
     [[nodiscard]] bool start()
     {
         startCall = session->call(Start, reporter);
@@ -156,13 +156,13 @@ protected:
                 return series.values;
         return {};
     }
-    // Why this machine has no trace; empty when it has.
+    // The reason why this machine cannot trace; empty if it can.
     [[nodiscard]] std::string missing() const
     {
         if (tracefs.problem())
             return *tracefs.problem();
         const std::string log = kestod.log();
-        const std::size_t place = log.find("there is no kernel trace: ");
+        const std::size_t place = log.find("the kernel trace is not available: ");
         return place == std::string::npos ? "" : log.substr(place, log.find('\n', place) - place);
     }
 
@@ -174,7 +174,7 @@ protected:
         return client.open(options) == kesto::Status::Ok;
     }
 
-    const support::RealTracefs tracefs; // before the service, which is to see it
+    const support::RealTracefs tracefs; // before the service, which must find it
     Kestod kestod{{{"feature-flags.toml", "[Sonalis]\nTracing = true\n"}}};
     const std::filesystem::path parametersPath = kestod.directory() / "parameters.plist";
     const std::filesystem::path resultsPath = kestod.directory() / "logs/Audio/Traces/tracing_results.qdj";
@@ -213,7 +213,7 @@ TEST_F(TraceTest, MeasuresWhatAClientEmitsFromSeveralThreads)
             most.push_back(bounds.most);
         }
     }
-    // Which of the shared ones is whose, the file does not say; but each has its place in the order of lengths.
+    // The file does not show the threads of the shared intervals, but each has its place in the order of lengths.
     std::ranges::sort(least);
     std::ranges::sort(most);
     std::vector<Bounds> shared;
@@ -281,18 +281,18 @@ TEST_F(TraceTest, MeasuresAgainWhenTheServiceWasKilledDuringATrace)
     ASSERT_TRUE(waitUntil([&] { return tracer.isActive(); }));
     tracer.emit(sharedBegin);
     kestod.kill();
-    EXPECT_TRUE(waitUntil([&] { return !tracer.isActive(); })) << "nobody reads what is emitted now";
+    EXPECT_TRUE(waitUntil([&] { return !tracer.isActive(); })) << "no service reads these events";
     EXPECT_FALSE(std::filesystem::exists(resultsPath));
 
     kestod.start();
     session.emplace(kestod.socketPath());
     ASSERT_TRUE(startSession());
     ASSERT_TRUE(waitUntil([&] { return tracer.isActive(); })) << "the client has connected again";
-    tracer.emit(sharedEnd); // of an interval that began in another life
+    tracer.emit(sharedEnd); // of an interval that began before the restart
     const Bounds bounds = emitInterval(tracer, sharedBegin, sharedEnd, std::chrono::microseconds(500));
     stopSession();
     expectWithin(results("shared"), {bounds});
-    EXPECT_EQ(kestod.countInLog("there is no kernel trace"), 0U) << "it is taken over";
+    EXPECT_EQ(kestod.countInLog("the kernel trace is not available"), 0U) << "it is taken over";
 }
 
 } // namespace

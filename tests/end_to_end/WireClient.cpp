@@ -1,5 +1,5 @@
-// Blocking, and without anything of the service's own but the encoding of single values: what a foreign client would
-// do. An answer that does not come is an exception, never a test that hangs.
+// Blocking, and with only the encoding of single values from the service, like a foreign client. A missing answer is an
+// exception, so that a test never hangs.
 #include "end_to_end/WireClient.h"
 
 #include "end_to_end/Kestod.h"
@@ -53,7 +53,7 @@ void WireClient::sendBytes(std::string_view bytes)
     while (!bytes.empty()) {
         const ssize_t count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL);
         if (count < 0)
-            return; // the service closed it; the reply that does not come will show
+            return; // the service closed it; the missing reply will show this
         bytes.remove_prefix(static_cast<std::size_t>(count));
     }
 }
@@ -80,7 +80,7 @@ void WireClient::closeSendingSide()
 
 void WireClient::reset()
 {
-    call(GetAllReporters); // an answer that nobody reads makes a close a reset
+    call(GetAllReporters); // an unread answer turns the close into a reset
     char byte = 0;
     ::recv(socket_.get(), &byte, 1, MSG_PEEK);
     close();

@@ -1,4 +1,4 @@
-// A client that speaks in frames and, where a test wants it, in bytes that are none.
+// A client that sends frames and, for some tests, other bytes.
 #pragma once
 
 #include "foundation/cbor/Cbor.h"
@@ -61,7 +61,7 @@ public:
     void closeSendingSide();
     // Ends the connection between frames.
     void close() { socket_ = platform::FileDescriptor(); }
-    // Ends it so that the service is told of a reset.
+    // Ends the connection with a reset.
     void reset();
 
 private:

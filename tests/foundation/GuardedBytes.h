@@ -1,5 +1,5 @@
-// Bytes right before a page that nobody may touch: whoever reads one byte beyond them ends the test program, with a
-// sanitizer or without.
+// Bytes right before an inaccessible page: code that reads one byte beyond them ends the test program, with or without
+// a sanitizer.
 #pragma once
 
 #include <cstddef>

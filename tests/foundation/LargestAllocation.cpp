@@ -1,4 +1,4 @@
-// The program's own operator new sees every request, and remembers the largest.
+// The program's own operator new records the largest request.
 #include "foundation/LargestAllocation.h"
 
 #include "support/Sanitizers.h"

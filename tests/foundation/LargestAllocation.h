@@ -1,9 +1,9 @@
-// How much memory was asked for in one piece, to prove that what a hostile length claims is not believed.
+// The largest single allocation, to prove that the code does not allocate for a hostile length.
 #pragma once
 
 #include <cstddef>
 
-// Forgets what was asked for so far.
+// Forgets earlier requests.
 void forgetAllocations() noexcept;
 // The largest request of this thread through `operator new` since then, in bytes.
 [[nodiscard]] std::size_t largestAllocation() noexcept;

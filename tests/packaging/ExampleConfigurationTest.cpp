@@ -1,4 +1,4 @@
-// The example configuration files are what they say they are: right, and saying nothing but the defaults.
+// The example configuration files are correct, and hold only the defaults.
 #include "platform/linux/settings/TomlFile.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
 

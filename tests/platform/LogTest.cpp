@@ -1,5 +1,4 @@
-// Log statements: what is below the threshold costs nothing and evaluates nothing, what is above it says where it
-// stands.
+// Log statements: a disabled statement does not evaluate its arguments, an enabled one shows its place in the source.
 #include "platform/Log.h"
 
 #include "support/TestPlatform.h"
@@ -106,7 +105,7 @@ TEST_F(LogTest, ThreadsMayMeetACategoryForTheFirstTimeTogether)
     EXPECT_EQ(platform_.log.take().size(), 4U);
 }
 
-// What an installation leaves behind must not be asked for a threshold, nor its absence remembered as one.
+// A category must neither ask an uninstalled log for a threshold nor keep one without a log.
 TEST(LogWithoutPlatform, DropsStatementsAndRemembersNothing)
 {
     LogCategory category(subsystem, "early");

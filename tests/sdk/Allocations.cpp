@@ -1,4 +1,4 @@
-// The program's own operator new counts, a count a thread, so that other threads do not disturb it.
+// The program's own operator new counts allocations, separately for each thread.
 #include "sdk/Allocations.h"
 
 #include "support/Sanitizers.h"

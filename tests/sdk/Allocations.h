@@ -1,11 +1,11 @@
-// Counts what a thread allocates, so that a test can say that something allocates nothing.
+// Counts a thread's allocations, so that a test can prove that a function does not allocate.
 #pragma once
 
 #include <cstddef>
 
 namespace sdk_test {
 
-// By the calling thread, since it began.
+// The calling thread's count since it began.
 [[nodiscard]] std::size_t allocations() noexcept;
 
 } // namespace sdk_test

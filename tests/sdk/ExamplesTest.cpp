@@ -1,5 +1,5 @@
-// libkesto as its users get it: installed somewhere, found with pkg-config or with CMake, linked by programs that know
-// nothing of its sources. The examples must compile without a warning, and report what they say they do.
+// libkesto as its users get it: installed, found with pkg-config or CMake, and linked by programs outside of the source
+// tree. The examples must compile without a warning, and report as they describe.
 #include "kesto/kesto.h"
 #include "sdk/FakeService.h"
 #include "sdk/Process.h"
@@ -34,7 +34,8 @@ std::vector<std::string> words(const std::string& text)
 
 class ExamplesTest : public testing::Test {
 protected:
-    // Installs the library once for all of these tests, and moves what was installed: it has to be found where it is.
+    // Installs the library once for all of these tests, and moves the installation, which must be found at its new
+    // place.
     static void SetUpTestSuite()
     {
         directory_ = std::make_unique<support::TemporaryDirectory>();
@@ -68,7 +69,7 @@ protected:
         EXPECT_EQ(compiled.errors, "");
     }
 
-    // Runs a player against a service, which must be told the whole story.
+    // Runs a player against a service, which must get all reports.
     static void expectReports(const std::string& program)
     {
         const support::TemporaryDirectory runtime;
@@ -88,7 +89,7 @@ protected:
         EXPECT_EQ(*calls[5][2].dictionary()->find("session_output_running"), foundation::Value(false));
     }
 
-    // Runs a driver helper, whose channels must be there as long as it runs.
+    // Runs a driver helper, whose channels must exist as long as it runs.
     static void expectPublishes(const std::string& program)
     {
         const support::TemporaryDirectory runtime;
@@ -104,7 +105,7 @@ protected:
         EXPECT_EQ(helper.errors(), "");
         EXPECT_TRUE(std::filesystem::is_empty(tree));
     }
-    // What a channel's file says behind the line that names its owner.
+    // The content of a channel's file behind its owner's line.
     static std::string contentOf(const std::string& path)
     {
         std::ifstream file(path);
@@ -164,8 +165,8 @@ TEST_F(ExamplesTest, TheDriverHelpersInCAndCPlusPlusPublish)
     expectPublishes(inCpp);
 }
 
-// The examples in a text: of a document, what stands in fences of that language; of a header, what is indented in its
-// comments. Each in a function of its own, behind what all of them include.
+// The examples in a text: in a document the fenced blocks of that language; in a header the indented parts of its
+// comments. Each becomes a function, behind common includes.
 std::string functionsOf(const std::vector<std::string>& files, const std::string& language, std::size_t& count)
 {
     std::string includes;
@@ -266,7 +267,7 @@ TEST_F(ExamplesTest, OnlyTheInterfaceIsVisibleFromOutside)
     const Finished inArchive = run({"nm", "--defined-only", "-g", library() + "/libkesto.a"});
     const std::size_t firstLine = inArchive.output.find("libkesto.o:\n");
     ASSERT_NE(firstLine, std::string::npos);
-    if (sanitizers.empty()) // which bring names of their own
+    if (sanitizers.empty()) // sanitizers add names of their own
         expectOnlyOurNames({inArchive.status, inArchive.output.substr(firstLine + 12), inArchive.errors});
 }
 

@@ -1,4 +1,4 @@
-// One thread and one poll for all peers; a test that wants to touch them has it done on that thread.
+// One thread and one poll for all peers; a test accesses them through that thread.
 #include "sdk/FakeService.h"
 
 #include <array>

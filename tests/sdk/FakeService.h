@@ -1,5 +1,5 @@
-// The other end of the wire, in the test's own process: speaks the protocol over a real socket, remembers what it was
-// told, and answers as the test wants.
+// The other end of the wire, in the test's own process: uses the protocol over a real socket, records the calls, and
+// answers as the test wants.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -19,7 +19,7 @@
 
 namespace sdk_test {
 
-// How long a test waits for what has to happen before it gives up.
+// How long a test waits before it fails.
 constexpr std::chrono::seconds patience{20};
 
 // A client's connection, seen from the service. The service's thread.
@@ -31,7 +31,7 @@ public:
     void answer(std::uint64_t call, std::vector<foundation::Value> values, foundation::Value error = {});
     void sendFrame(std::string_view frame);
     void sendBytes(std::string_view bytes);
-    // Has the next frame bring descriptors along, which stay the caller's.
+    // Sends descriptors, which the caller keeps, with the next frame.
     void attach(std::vector<int> descriptors) { attached_ = std::move(descriptors); }
     // Ends the connection after the current call.
     void close() { isOver_ = true; }
@@ -64,7 +64,7 @@ public:
     FakeService(const FakeService&) = delete;
     FakeService& operator=(const FakeService&) = delete;
 
-    // The calls of all clients so far, once there are so many or patience is at its end.
+    // Waits for so many calls, or until the time is over, and returns all calls so far.
     [[nodiscard]] std::vector<foundation::Array> waitForCalls(std::size_t count);
     [[nodiscard]] std::size_t connections() const; // that were made so far
 

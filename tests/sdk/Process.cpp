@@ -1,5 +1,5 @@
-// A thread collects all that the program says, so that it never waits for its reader, and a process descriptor tells
-// its end.
+// A thread collects the program's output, so that the program never waits for its reader, and a process descriptor
+// shows its end.
 #include "sdk/Process.h"
 
 #include "sdk/FakeService.h"

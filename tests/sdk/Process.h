@@ -1,4 +1,4 @@
-// Programs that a test runs: what goes in, what comes out, how they end. They end with the object at the latest.
+// Programs that a test runs: input, output, exit status. They end with the object at the latest.
 #pragma once
 
 #include "foundation/Mutex.h"

@@ -1,4 +1,4 @@
-// What a client's callbacks were told, for a test to wait for.
+// Records the calls of a client's callbacks, and lets a test wait for them.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -21,7 +21,7 @@ public:
         changed_.notifyAll();
     }
 
-    // The entries so far, once there are so many or patience is at its end.
+    // Waits for so many entries, or until the time is over, and returns all entries so far.
     [[nodiscard]] std::vector<Entry> waitFor(std::size_t count)
     {
         const auto deadline = std::chrono::steady_clock::now() + patience;
@@ -39,7 +39,7 @@ private:
     std::vector<Entry> entries_ KESTO_GUARDED_BY(mutex_);
 };
 
-// Answers in words: "create", or "create: the connection to the service was lost".
+// Answers as text: "create", or "create: the connection to the service was lost".
 class Answers : public Recorder<std::string> {
 public:
     [[nodiscard]] kesto::AnswerCallback named(std::string name)

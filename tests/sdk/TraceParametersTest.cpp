@@ -1,4 +1,4 @@
-// The words in which programs write trace-parameters files are those that the service reads.
+// The public header and the service have the same words for trace-parameters files.
 #include "tracing/TraceParams.h"
 
 #include <gtest/gtest.h>

@@ -1,5 +1,5 @@
-// Emitting trace events: what a program does with a tracer while its client connects, is handed the marker, and loses
-// its connection again. The marker is a pipe, the page the service's own.
+// Emitting trace events while a client connects, gets the marker, and loses its connection again. The marker is a pipe,
+// the page the service's own.
 #include "kesto/trace.hpp"
 #include "platform/linux/trace/TraceMarker.h"
 #include "platform/linux/trace/TraceMarkerAccess.h"
@@ -48,7 +48,7 @@ protected:
     }
 
     static bool isRequest(const Array& call) { return call.size() == 2 && call[1].string().has_value(); }
-    // Hands over what it is to.
+    // Sends the descriptors.
     void answer(Peer& peer, const Array& call)
     {
         if (!isRequest(call))
@@ -81,7 +81,7 @@ protected:
             std::this_thread::yield();
         return result;
     }
-    // What has come out of the marker, whole records.
+    // The complete records that were written to the marker.
     std::vector<TraceMarkerRecord> records()
     {
         std::vector<TraceMarkerRecord> records(1000);
@@ -116,7 +116,7 @@ protected:
     kesto::Client client;
 };
 
-TEST_F(TracerTest, EmitsWhileSomebodyTraces)
+TEST_F(TracerTest, EmitsWhileATraceRuns)
 {
     serve();
     open();
@@ -187,7 +187,7 @@ TEST_F(TracerTest, GoesSilentWithTheConnectionAndOnWithTheNext)
     open(true, true);
     const kesto::Tracer tracer(client);
     ASSERT_TRUE(waitUntil([&] { return tracer.isActive(); }));
-    service.reset(); // killed in the middle of a trace: its page says for ever that it goes on
+    service.reset(); // killed during a trace: its page shows the trace for ever
     ASSERT_TRUE(waitUntil([&] { return !tracer.isActive(); }));
     kesto_tracer_emit(tracer.get(), 1, 0, 0, 0, 0);
     EXPECT_THAT(codes(), IsEmpty());
@@ -292,7 +292,7 @@ TEST_F(TracerTest, CallsNothingAndAllocatesNothingForRealTime)
     errno = EXDEV;
     const auto before = sdk_test::allocations();
     tracer.emit(1);
-    const int error = errno; // at once: what follows may make calls of its own
+    const int error = errno; // at once, because later code may change it
     EXPECT_EQ(sdk_test::allocations(), before);
     EXPECT_EQ(error, EXDEV);
     out = {};

@@ -1,5 +1,5 @@
-// Looking a session up over all clients, against what it is defined as: a walk over the registry that stops at the
-// first client which has the ID.
+// Finding a session over all clients, compared with its definition: a walk over the registry that stops at the first
+// client with the ID.
 #include "service/KestoReportingReporterIndex.h"
 #include "support/ServiceHarness.h"
 
@@ -70,7 +70,7 @@ TEST_F(BareIndexTest, DoesNotCountClientsThatAreNotRegistered)
     index.remove(42, client(0));
 }
 
-TEST_F(BareIndexTest, KeepsTheOrderOfRegistrationWhateverTheOrderOfCreation)
+TEST_F(BareIndexTest, KeepsTheOrderOfRegistrationForAnyOrderOfCreation)
 {
     index.registerClient(client(1));
     index.registerClient(client(0));

@@ -1,4 +1,4 @@
-// A connection's beginning and end as the service sees them, and the event that tells how long it lasted.
+// A connection's beginning and end in the service, and the event with its duration.
 #include "support/ServiceHarness.h"
 #include "support/WatchedThread.h"
 
@@ -30,7 +30,7 @@ protected:
     }
 
     std::shared_ptr<FakeConnection> accept() { return harness.listener.connect(pid); }
-    // Accepted and registered, and nothing said of it.
+    // Accepts and registers a connection, and clears the log.
     std::shared_ptr<FakeConnection> connect()
     {
         auto connection = accept();
@@ -251,7 +251,7 @@ TEST_F(ConnectionTest, WhoseClientIsFreedAlreadyKnowsNothingOfIt)
     EXPECT_EQ(platform.workQueues.pending(), 0U);
 }
 
-TEST_F(ConnectionTest, IsHeldByNobodyWhenItIsOver)
+TEST_F(ConnectionTest, IsReleasedWhenItIsOver)
 {
     auto connection = connect();
     connection->call({1, 1, 42});

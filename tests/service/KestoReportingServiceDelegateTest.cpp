@@ -1,4 +1,4 @@
-// The service object's making, its defaults, and what it answers its clients.
+// The making of the service object, its defaults, and its answers to clients.
 #include "service/KestoReportingServiceDelegate.h"
 #include "support/ServiceHarness.h"
 
@@ -158,7 +158,7 @@ protected:
     KestoReportingServiceDelegate& service = *harness.service;
 };
 
-TEST_F(ServiceTest, IsEnabledWhateverThePreferencesSay)
+TEST_F(ServiceTest, IsEnabledWithAllPreferences)
 {
     EXPECT_TRUE(service.isReportingEnabled());
     const ServiceHarness disabled(
@@ -166,7 +166,7 @@ TEST_F(ServiceTest, IsEnabledWhateverThePreferencesSay)
     EXPECT_TRUE(disabled.service->isReportingEnabled());
 }
 
-TEST_F(ServiceTest, CountsNoActiveSessionsWhateverIsStarted)
+TEST_F(ServiceTest, CountsNoActiveSessionsAfterAnyStarts)
 {
     auto player = harness.connect();
     player.call(CreateReportingSession, 42);
@@ -416,10 +416,10 @@ TEST_F(InternalServiceTest, TellsBugCapturesOfItsClientsAndTheirSessions)
         recorder.call(CreateReportingSession, reporter);
     const Dictionary state = *describeState().dictionary();
     EXPECT_EQ(*state.find("sessions"), Value(302));
-    EXPECT_EQ(state.find("shown")->array()->size(), 200U) << "no more than whoever asks can wait for";
+    EXPECT_EQ(state.find("shown")->array()->size(), 200U) << "so few that the requesting thread is not delayed";
 
     harness.service.reset();
-    EXPECT_EQ(describeState(), Value()) << "nobody is asked who is gone";
+    EXPECT_EQ(describeState(), Value()) << "a destroyed service is not called";
 }
 
 TEST(ServiceOfAnInternalBuild, IsOneOrNotForItsWholeLife)

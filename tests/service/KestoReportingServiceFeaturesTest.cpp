@@ -1,4 +1,4 @@
-// Device-wide settings: how they are read, and which sessions are told.
+// Device-wide settings: how they are read, and which sessions get them.
 #include "support/ServiceHarness.h"
 
 #include <gmock/gmock.h>
@@ -147,7 +147,7 @@ TEST_F(FeaturesTest, RoundTheUptimeToTheNearestSecond)
 
 // --- changes
 
-TEST_F(FeaturesTest, ThatChangeAreToldToEverySessionOfEveryClientStartedOrNot)
+TEST_F(FeaturesTest, ThatChangeAreSentToEverySessionOfEveryClientStartedOrNot)
 {
     auto player = harness.connect();
     auto recorder = harness.connect();
@@ -176,7 +176,7 @@ TEST_F(FeaturesTest, ThatChangeAreToldToEverySessionOfEveryClientStartedOrNot)
     EXPECT_THAT(*recorder.session(43)->nestedAggregatedPayloadData(), ElementsAre(told));
 }
 
-TEST_F(FeaturesTest, ThatChangeAreToldWhenNothingIsKnownToo)
+TEST_F(FeaturesTest, ThatChangeAreSentWhenNothingIsKnownToo)
 {
     auto player = harness.connect();
     player.call(CreateReportingSession, 42);
@@ -191,7 +191,7 @@ TEST_F(FeaturesTest, ThatChangeAreToldWhenNothingIsKnownToo)
                 ElementsAre(Dictionary{{"Setup_Setup_1", Dictionary{{"audiotag", "SetupSetup"}}}}));
 }
 
-TEST_F(FeaturesTest, AreToldToNoSink)
+TEST_F(FeaturesTest, AreNotSentToSinks)
 {
     platform.analytics.use("*");
     auto player = harness.connect();
@@ -214,7 +214,7 @@ TEST_F(FeaturesTest, AreReadAtTheirChangeAndNotRemembered)
     std::vector<std::string> told;
     for (const auto& message : messages)
         told.push_back(message.values()[0].dictionary()->find("ringerstate")->text());
-    EXPECT_THAT(told, ElementsAre("1", "0")) << "the second says nothing new, whatever its time";
+    EXPECT_THAT(told, ElementsAre("1", "0")) << "the second is a repetition, even with another time";
 }
 
 TEST_F(FeaturesTest, AreListenedForAsLongAsTheServiceLives)

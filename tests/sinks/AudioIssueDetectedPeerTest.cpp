@@ -1,5 +1,5 @@
-// libprotobuf's generated class as the other side: what we write it reads, what it writes we read, over records and
-// foreign fields that RapidCheck makes up; and of broken bytes we accept nothing that it refuses.
+// libprotobuf's generated class as the other side: each reads the other's bytes, with records and foreign fields from
+// RapidCheck; and the record refuses all broken bytes that libprotobuf refuses.
 #include "sinks/AudioIssueDetected.h"
 
 #include "AudioIssueDetected.pb.h"
@@ -49,7 +49,7 @@ peer::AudioIssueDetected peerOf(const AudioIssueDetected& record)
     return other;
 }
 
-// The fields alone: what is set says more in the peer, which can tell an empty text from none.
+// Compares only the fields: the peer also distinguishes an empty text from a missing one.
 bool haveSameFields(const AudioIssueDetected& record, const peer::AudioIssueDetected& other)
 {
     return record.hasTimestamp() == other.has_timestamp() && record.timestamp() == other.timestamp()
@@ -130,7 +130,7 @@ RC_GTEST_PROP(AudioIssueDetectedPeer, FindsTheSameFieldsAmongForeignOnes, ())
     RC_ASSERT(haveSameFields(record, other));
 }
 
-// Refused bytes go different ways: what was read before the broken place is not compared.
+// For refused bytes the fields before the error may differ, so they are not compared.
 RC_GTEST_PROP(AudioIssueDetectedPeer, AcceptsWhatWeAcceptOfBrokenBytes, ())
 {
     const google::protobuf::LogSilencer silent; // about text that is not UTF-8

@@ -1,4 +1,4 @@
-// The record by itself: what its bytes and its text are, and which records are equal.
+// The record by itself: its bytes, its text, and its equality.
 #include "sinks/AudioIssueDetected.h"
 
 #include "foundation/GuardedBytes.h"

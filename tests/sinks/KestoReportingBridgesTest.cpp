@@ -1,4 +1,4 @@
-// What leaves the device, and under which names.
+// The events of a message, and their names.
 #include "sinks/KestoReportingFennicBridge.h"
 #include "sinks/KestoReportingGimboUtility.h"
 #include "sinks/KestoReportingTrelmBridge.h"
@@ -96,7 +96,7 @@ TEST_F(FennicBridgeTest, NamesWhatItDoesNotKnow)
                             "com.quarn.kesto.Undefined.Generic", "com.quarn.telephony.Undefined.Generic"));
 }
 
-// Names are remembered at places that their numbers give: 65 lies at the place of 1, 64 at that of 0, 68 at that of 4.
+// Numbers determine the cache places of names: 65 has the place of 1, 64 that of 0, 68 that of 4.
 TEST_F(FennicBridgeTest, NamesEventsByTheirOwnNumbersAfterOthers)
 {
     platform.analytics.use("*");
@@ -143,7 +143,7 @@ TEST_F(FennicBridgeTest, BuildsNothingWhenNeitherNameIsWanted)
 {
     send({{"a", 1}});
     EXPECT_THAT(platform.analytics.sent(), IsEmpty());
-    EXPECT_EQ(session.use_count(), 1) << "nobody holds the session for a payload that nobody needs";
+    EXPECT_EQ(session.use_count(), 1) << "an unneeded payload does not hold the session";
 }
 
 TEST_F(FennicBridgeTest, BuildsNoPayloadBeforeItIsNeeded)

@@ -1,4 +1,4 @@
-// When a leaked haptics session is suspected, and what is asked for then.
+// When a leaked haptics session is suspected, and the request for a snapshot.
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 #include "support/TestPlatform.h"
 
@@ -68,7 +68,7 @@ TEST_F(VorpStateManagerTest, BeginsWithNothingCountedAndNoReporter)
     EXPECT_EQ(manager.ulmetReporter(), nullptr);
 }
 
-TEST_F(VorpStateManagerTest, IgnoresThatThereIsNoMessage)
+TEST_F(VorpStateManagerTest, IgnoresAMissingMessage)
 {
     send(std::nullopt);
     expectNothingHappened();
@@ -101,7 +101,7 @@ TEST_F(VorpStateManagerTest, CountsAndKeepsTheFirstReport)
     EXPECT_EQ(platform.bugCapture.reportersMade(), 0);
 }
 
-TEST_F(VorpStateManagerTest, CountsWhateverTheCategory)
+TEST_F(VorpStateManagerTest, CountsForEveryCategory)
 {
     send(a, gimbo, 0xFFFFFFFF);
     EXPECT_EQ(manager.leakedHapticsSessionCounter(), 1U);
@@ -109,7 +109,7 @@ TEST_F(VorpStateManagerTest, CountsWhateverTheCategory)
     EXPECT_THAT(snapshots(), SizeIs(1));
 }
 
-TEST_F(VorpStateManagerTest, CountsWhateverTheTimeIs)
+TEST_F(VorpStateManagerTest, CountsForEveryTime)
 {
     const Value times[] = {0, -1, "text", Value(), false, std::numeric_limits<double>::quiet_NaN(), Array{1}};
     for (const Value& time : times) {

@@ -1,4 +1,4 @@
-// JSON read by a library that the service does not read with: what it makes of a text is what others make of it.
+// Reads JSON with a library that the service does not use for reading, as other programs do.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -12,7 +12,7 @@
 
 namespace support {
 
-// Builds a value from what RapidJSON's reader tells.
+// Builds a value from RapidJSON's events.
 class JsonValueBuilder {
 public:
     [[nodiscard]] foundation::Value take() { return std::move(values_.back()); }
@@ -53,10 +53,10 @@ private:
         return true;
     }
 
-    std::vector<foundation::Value> values_; // those that are in no container yet; keys, too
+    std::vector<foundation::Value> values_; // those that are not in a container yet; keys, too
 };
 
-// Nothing when the text is no JSON, or not all of it.
+// Nothing if the text is not exactly one JSON value.
 inline std::optional<foundation::Value> parseJson(std::string_view text)
 {
     rapidjson::MemoryStream stream(text.data(), text.size());

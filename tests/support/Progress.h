@@ -1,4 +1,4 @@
-// Something that threads tell each other: a state that is waited for.
+// A state that threads share, and for which they can wait.
 #pragma once
 
 #include <chrono>
@@ -7,12 +7,12 @@
 
 namespace support {
 
-constexpr std::chrono::seconds longestWait{30}; // for what must happen; a test that waits so long fails
+constexpr std::chrono::seconds longestWait{30}; // a test that waits this long fails
 
 // Any thread.
 class Progress {
 public:
-    // Changes what the predicates look at.
+    // Changes the state that the predicates read.
     template <typename Change> void change(Change change)
     {
         const std::scoped_lock lock(mutex_);

@@ -1,10 +1,10 @@
-// What a sanitizer needs of the process that it watches.
+// Skips tests whose conditions a sanitizer changes.
 #pragma once
 
 #include <gtest/gtest.h>
 
-// The undefined-behaviour sanitizer opens a pipe each time it looks at an object's dynamic type for the first time: a
-// test that leaves the process without descriptors would fail for that.
+// The undefined-behaviour sanitizer opens a pipe when it first checks an object's dynamic type: a test that leaves the
+// process without descriptors would fail.
 #ifdef KESTO_UNDEFINED_SANITIZER
 #define KESTO_SKIP_WHERE_TYPES_ARE_CHECKED() GTEST_SKIP() << "the sanitizer needs the descriptors that this test takes"
 #else
@@ -30,8 +30,8 @@ constexpr bool threadSanitizerWatches = false;
     } else                                     \
         GTEST_SKIP() << "the thread sanitizer has a thread of its own, that does not rest"
 
-// The address sanitizer keeps what is released, to see who touches it, and the thread sanitizer notes of all memory who
-// touched it last.
+// The address sanitizer keeps released memory, to find later uses, and the thread sanitizer records the last access to
+// all memory.
 #if defined(__SANITIZE_ADDRESS__)
 constexpr bool addressSanitizerWatches = true;
 #elif defined(__has_feature)

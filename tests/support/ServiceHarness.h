@@ -38,7 +38,7 @@ enum Method : std::uint8_t {
     KillService
 };
 
-// What came back for one call, in order: each [error, values...].
+// The answers to one call, in order: each [error, values...].
 using Answers = std::vector<foundation::Array>;
 inline const foundation::Value null{};
 inline const foundation::Array succeeded{null, true};
@@ -65,7 +65,7 @@ template <typename Work> auto onServerQueue(FakeWorkQueues& queues, Work work)
     return result.get();
 }
 
-// A client process. Declared after its service, so that it goes first.
+// A client process. Declare it after its service, so that it is destroyed first.
 class TestClient {
 public:
     TestClient(FakeWorkQueues& queues, std::shared_ptr<FakeConnection> connection,
@@ -76,18 +76,18 @@ public:
     {
     }
 
-    // Makes the call, lets the service work until it rests, and tells what was answered.
+    // Makes the call, lets the service work until it is idle, and returns the answers.
     template <typename... Arguments> Answers call(Method method, const Arguments&... arguments)
     {
         const std::uint64_t number = submit(method, {foundation::Value(arguments)...});
         queues_->runAll();
         return answersTo(number);
     }
-    // Only makes the call; its number.
+    // Only makes the call; returns its number.
     std::uint64_t submit(Method method, const foundation::Array& arguments);
     [[nodiscard]] Answers answersTo(std::uint64_t number) const;
 
-    // The end of the connection, and what the service does about it.
+    // Ends the connection, and lets the service handle this.
     void close();
     void breakOff();
 
@@ -113,7 +113,7 @@ public:
     TestClient connect(std::string processName = "player");
     // Forgets what was logged and traced so far.
     void forget();
-    // Asks the service for a session, as whoever delivers a message does.
+    // Finds a session in the service, as the delivery of a message does.
     std::shared_ptr<KestoReportingSession> find(std::int64_t reporterID)
     {
         return onServerQueue(platform.workQueues, [&] { return service->findReportingSessionForID(reporterID); });

@@ -25,7 +25,7 @@ TestPlatform::TestPlatform()
 
 TestPlatform::~TestPlatform()
 {
-    // What waits here may hold sessions, and those say farewell to the platform.
+    // Waiting items may hold sessions, whose destructors use the platform.
     workQueues.discardAll();
     analytics.clear();
     platform::uninstall();

@@ -17,7 +17,7 @@
 
 namespace support {
 
-// One at a time. Whatever uses the platform is declared after it, so that it goes first.
+// One at a time. Declare users of the platform after it, so that they are destroyed first.
 class TestPlatform {
 public:
     TestPlatform();

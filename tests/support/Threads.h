@@ -18,7 +18,7 @@
 
 namespace support {
 
-// Starts a thread and waits until nothing is left of it. The thread sanitizer starts its own beside the first one.
+// Starts a thread and waits for its complete end. The thread sanitizer starts its own thread with the first one.
 inline void bringForthTheSanitizersThread()
 {
     std::filesystem::path folder;

@@ -1,4 +1,4 @@
-// A process that does something, and lives until a test kills it.
+// A process that performs an action, and lives until a test kills it.
 #pragma once
 
 #include <array>
@@ -10,10 +10,10 @@
 
 namespace support {
 
-// To be made before the test has threads: the process is a copy of the test's.
+// Make it before the test starts threads, because the process is a fork of the test's.
 class Victim {
 public:
-    // `act` tells whether it succeeded; that it does is expected.
+    // `act` returns whether it succeeded, which is expected.
     explicit Victim(const std::function<bool()>& act)
     {
         std::array<int, 2> ends{};
@@ -35,7 +35,7 @@ public:
     Victim(const Victim&) = delete;
     Victim& operator=(const Victim&) = delete;
 
-    // By SIGKILL; it is gone when this returns.
+    // Kills it with SIGKILL and waits for its end.
     void kill()
     {
         if (process_ <= 0)

@@ -1,5 +1,5 @@
-// Threads as the kernel sees them, for tests of who waits for whom: such a test goes on when a thread sleeps, not after
-// a while.
+// Threads as the kernel shows them, for tests of waiting: such a test goes on when a thread sleeps, and not after a
+// fixed time.
 #pragma once
 
 #include <atomic>
@@ -12,7 +12,7 @@
 
 namespace support {
 
-// Whether that thread of this process sleeps. The kernel says so: "1234 (name) S ...".
+// Whether that thread of this process sleeps, according to the kernel: "1234 (name) S ...".
 inline bool isAsleep(pid_t thread)
 {
     std::ifstream file("/proc/self/task/" + std::to_string(thread) + "/stat");
@@ -35,7 +35,7 @@ public:
     }
 
     [[nodiscard]] bool isDone() const { return isDone_; }
-    // Waits until the thread sleeps or its work is done. True when it sleeps.
+    // Waits until the thread sleeps or its work is done. True if it sleeps.
     [[nodiscard]] bool fallsAsleep() const
     {
         while (!isDone_) {
@@ -49,7 +49,7 @@ public:
 private:
     std::atomic<pid_t> number_{0};
     std::atomic<bool> isDone_{false};
-    std::jthread thread_; // goes first: it uses the others
+    std::jthread thread_; // destroyed first: it uses the other members
 };
 
 } // namespace support

@@ -1,4 +1,4 @@
-// A runner on fakes, and what its tests need to drive it.
+// A runner on fakes, with helper functions for its tests.
 #pragma once
 
 #include "support/TestPlatform.h"

@@ -1,4 +1,4 @@
-// Events of a kernel trace in as few words as a test needs.
+// Short notations for events of a kernel trace.
 #pragma once
 
 #include "tracing/TraceData.h"

@@ -1,4 +1,4 @@
-// Which events pair up to intervals, and what is said of those that do not.
+// Which events form intervals, and the log lines about the others.
 #include "tracing/TraceInterval.h"
 #include "support/TestPlatform.h"
 #include "tracing/TraceEventsOf.h"
@@ -44,7 +44,7 @@ protected:
         EXPECT_EQ(interval.getNumTimesTraced(), interval.getResults().size());
         return interval.getResults();
     }
-    // The lines that tell of so many discarded starts and, with the same number, of stops.
+    // The log lines about so many discarded starts and as many stops.
     [[nodiscard]] static auto starts(platform::LogLevel level, unsigned count)
     {
         return IsLine(level, "kert",
@@ -218,7 +218,7 @@ TEST_F(AnyThreadInterval, WrapsAroundWhenItsEndIsEarlierThanItsStart)
     EXPECT_THAT(byThread.getResults(), ElementsAre(minusThree));
 }
 
-TEST_F(AnyThreadInterval, IsInNanosecondsWhateverTheUnitOfTheSessionsTime)
+TEST_F(AnyThreadInterval, IsInNanosecondsForEveryUnitOfTheSessionsTime)
 {
     platform.kernelTrace.toNanoseconds = [](std::uint64_t timestamp) { return timestamp * 125 / 3; };
     TraceInterval byThread("mix", beginCode, endCode, true);
@@ -237,7 +237,7 @@ TEST_F(AnyThreadInterval, HasAnAverageInThePrecisionOfAFloat)
 {
     process({begin(1), end(2), begin(10), end(14), begin(20), end(24)});
     EXPECT_EQ(interval.getAverageResult(), 3.0F);
-    process({begin(1), end(16'777'218)}); // 2^24 + 1 is no float; nor are the sums
+    process({begin(1), end(16'777'218)}); // a float cannot hold 2^24 + 1, nor the sums
     EXPECT_EQ(interval.getAverageResult(), (16'777'216.0F + 8.0F) / 4);
 }
 
@@ -254,7 +254,7 @@ TEST_F(AnyThreadInterval, HasNoNumberForItsAverageWithoutResults)
     EXPECT_TRUE(std::isnan(interval.getAverageResult()));
 }
 
-// --- against a formulation that only looks backwards
+// --- compared with a formulation that only looks backwards
 
 struct Measured {
     std::vector<std::uint64_t> results;
@@ -262,7 +262,7 @@ struct Measured {
     unsigned stopDiscards = 0;
 };
 
-// Each start or stop is judged by the one before it among those that it could pair with.
+// Each start or stop is decided by the previous one among those with which it could pair.
 Measured measureNaively(const Events& events, std::uint32_t first, std::uint32_t last, bool byThread)
 {
     Measured measured;

@@ -1,4 +1,4 @@
-// Whatever a client may have put at the path that it names: reading ends at once, with an empty record and a line.
+// A client may name anything as its file: reading ends at once, with an empty record and a log line.
 #include "tracing/TraceParamsParser.h"
 
 #include "foundation/plist/PropertyListWriter.h"
@@ -20,7 +20,7 @@ using testing::Contains;
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-// The process's current directory, a new one, until it is gone.
+// A new directory that is the process's current directory as long as this object lives.
 class CurrentDirectory {
 public:
     explicit CurrentDirectory(const fs::path& path)

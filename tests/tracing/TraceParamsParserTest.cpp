@@ -1,4 +1,4 @@
-// Trace-parameters files, good and bad, in both encodings: what is read of them, and what is said.
+// Correct and wrong trace-parameters files, in both encodings: their content and the log lines.
 #include "tracing/TraceParamsParser.h"
 
 #include "foundation/plist/PropertyListWriter.h"
@@ -61,7 +61,7 @@ protected:
         platform.fileSystem.files.insert_or_assign(path, std::string(bytes));
         return TraceParamsParser(std::string(path)).loadTraceParams();
     }
-    // A file with that root, in both encodings, which must say the same.
+    // A file with that root, in both encodings, which must have the same content.
     TraceParams read(const Value& root)
     {
         const auto binary = load(support::binaryPropertyList(root));
@@ -97,7 +97,7 @@ protected:
     support::TestPlatform platform;
 };
 
-// --- what a good file says
+// --- correct files
 
 TEST_F(TraceParamsFile, HoldsATraceWithItsPointsInOrder)
 {
@@ -204,7 +204,7 @@ TEST_F(TraceParamsFile, HasCodesThatAreScannedAsHexadecimal)
     EXPECT_EQ(code("0x2104000c"), 0x2104000CU);
     EXPECT_EQ(code("0X2104000c"), 0x2104000CU);
     EXPECT_EQ(code(" \n\t2104000c"), 0x2104000CU);
-    EXPECT_EQ(code("21 04"), 0x21U) << "up to what is no digit";
+    EXPECT_EQ(code("21 04"), 0x21U) << "up to the first character that is not a digit";
     EXPECT_EQ(code("ffffffff"), 0xFFFFFFFFU);
     EXPECT_EQ(code("0000000000001"), 1U);
     EXPECT_EQ(code("100000000"), 0xFFFFFFFFU) << "the greatest there is";
@@ -255,7 +255,7 @@ TEST_F(TraceParamsFile, IsUnderstoodAlsoWithoutAPlatform)
               "Failed to load Trace Parameter dictionary with error : it is a number, not a dictionary");
 }
 
-// --- what is wrong with the file
+// --- wrong files
 
 TEST_F(TraceParamsFile, NamesTheFirstThingThatIsWrongWithIt)
 {
@@ -301,7 +301,7 @@ TEST_F(TraceParamsFile, ThatIsMissingIsSaidAndYieldsAnEmptyRecord)
     expectEmpty(*TraceParamsParser("/missing").loadTraceParams());
     EXPECT_THAT(lines(),
                 ElementsAre(Says(Error, "Reading from plist file failed with error: No such file or directory"),
-                            Says(Error, "Reading from plist file failed with error: there are no bytes"),
+                            Says(Error, "Reading from plist file failed with error: the file is empty"),
                             Says(Error, "No valid input found in plist."),
                             Says(Error, "Failed to load Trace Parameter Array with error: " + missing)));
 }
@@ -312,12 +312,12 @@ TEST_F(TraceParamsFile, ThatIsTooLargeIsNotRead)
     EXPECT_THAT(lines(), Contains(Says(Error, "Reading from plist file failed with error: File too large")));
 }
 
-TEST_F(TraceParamsFile, ThatIsNoPropertyListIsSaidToBeNone)
+TEST_F(TraceParamsFile, ThatIsNotAPropertyListIsReported)
 {
     for (const auto& [bytes, why] :
          {std::pair("<plist>\n<dict><key>Children</key>\n</dict></plist>",
                     "line 2: the last key of the dictionary has no value"),
-          std::pair("bplist00", "trailer: the file ends before it"), std::pair("", "there are no bytes")}) {
+          std::pair("bplist00", "trailer: the file ends before it"), std::pair("", "the file is empty")}) {
         expectEmpty(*load(bytes));
         EXPECT_THAT(lines(),
                     ElementsAre(Says(Error, std::string("Reading from plist file failed with error: ") + why),
@@ -326,7 +326,7 @@ TEST_F(TraceParamsFile, ThatIsNoPropertyListIsSaidToBeNone)
     }
 }
 
-TEST_F(TraceParamsFile, ThatHoldsNothingIsNoValidInput)
+TEST_F(TraceParamsFile, ThatHoldsNothingIsNotValidInput)
 {
     expectEmpty(*load(support::binaryPropertyList(Value())));
     EXPECT_THAT(lines(),
@@ -334,7 +334,7 @@ TEST_F(TraceParamsFile, ThatHoldsNothingIsNoValidInput)
                             Says(Error, "Failed to load Trace Parameter Array with error: " + missing)));
 }
 
-TEST_F(TraceParamsFile, ThatIsNoDictionaryHasNoTraces)
+TEST_F(TraceParamsFile, ThatIsNotADictionaryHasNoTraces)
 {
     for (const Value& root : {Value(Array{trace("A", Array())}), Value("text"), Value(7), Value(Dictionary())}) {
         expectEmpty(read(root));
@@ -342,7 +342,7 @@ TEST_F(TraceParamsFile, ThatIsNoDictionaryHasNoTraces)
     }
 }
 
-TEST_F(TraceParamsFile, WhoseTracesAreNoArrayHasNone)
+TEST_F(TraceParamsFile, WhoseTracesAreNotAnArrayHasNone)
 {
     const auto said = [this](const Value& traces) {
         expectEmpty(read(file(traces)));
@@ -358,7 +358,7 @@ TEST_F(TraceParamsFile, WhoseTracesAreNoArrayHasNone)
     EXPECT_THAT(errors(), IsEmpty());
 }
 
-TEST_F(TraceParamsFile, WithATraceThatIsNoDictionaryGoesOnBehindIt)
+TEST_F(TraceParamsFile, WithATraceThatIsNotADictionaryGoesOnBehindIt)
 {
     const TraceParams params = read(file(Array{"A", trace("B", Array{point("b", "Interval", "1", "2")}), Array{}}));
     EXPECT_EQ(params.name, "B");
@@ -384,7 +384,7 @@ TEST_F(TraceParamsFile, WithoutANameTakesThatOfTheNextTraceThatHasOne)
                             Says(Error, "Description not found in the plist file")));
 }
 
-TEST_F(TraceParamsFile, WhosePointsAreNoArrayGoesOnWithTheNextTrace)
+TEST_F(TraceParamsFile, WhosePointsAreNotAnArrayGoesOnWithTheNextTrace)
 {
     const TraceParams params = read(file(Array{trace("A", "none"), trace("B", Array{point("b", "Level", "1")})}));
     EXPECT_THAT(params.traceDataParams, SizeIs(1));
@@ -411,7 +411,7 @@ TEST_F(TraceParamsFile, WithAPointOfUnknownTypeHoldsItWithWhatThePointBeforeHad)
                             Says(Info, "Loading tracepoint : 1 and 2 \n finished parsing.")));
 }
 
-TEST_F(TraceParamsFile, WithAPointThatIsNoDictionaryHoldsOneWithoutAName)
+TEST_F(TraceParamsFile, WithAPointThatIsNotADictionaryHoldsOneWithoutAName)
 {
     EXPECT_THAT(readPoints({point("a", "Interval", "1", "2"), "b"}),
                 ElementsAre(TraceDataParams("a", 1, 1, 2, false), ofUnknownType({"", 1, 1, 2, false})));

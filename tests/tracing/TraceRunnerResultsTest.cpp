@@ -1,4 +1,4 @@
-// The end of a runner's work: what stands in the results file and in the log, and what happens without a file.
+// The end of a runner's work: the results file, the log, and failures of the file.
 #include "tracing/RunnerFixture.h"
 
 #include <algorithm>
@@ -138,7 +138,7 @@ TEST_F(RunnerResults, SayWhyATraceCouldNotBeRun)
     platform.kernelTrace.filterError = 22;
     EXPECT_EQ(problemOf("two"), foundation::Value("Could not set up ktrace range, error: 22"));
     platform.kernelTrace.available = false;
-    EXPECT_EQ(problemOf("three"), foundation::Value("there is no kernel trace; three collects no events"));
+    EXPECT_EQ(problemOf("three"), foundation::Value("the kernel trace is not available; three collects no events"));
 }
 
 TEST_F(RunnerResults, OfEachTraceAreOrderedByName)
@@ -198,7 +198,7 @@ TEST_F(RunnerResults, MakeAFileWithoutRecordsWhenNothingWasMeasured)
 
 TEST_F(RunnerResults, AreWrittenAllTheSameWhenTheDirectoryCannotBeMade)
 {
-    platform.fileSystem.directories = {{"/diagnostics/Audio/Traces", 0777}}; // which is there, all the same
+    platform.fileSystem.directories = {{"/diagnostics/Audio/Traces", 0777}}; // the folder exists
     platform.fileSystem.directoryError = std::make_error_code(std::errc::permission_denied);
     trace({5});
     EXPECT_THAT(platform.log.lines(),

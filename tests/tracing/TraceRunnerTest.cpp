@@ -1,4 +1,4 @@
-// Running traces: which are set up, what becomes of their events, and in which order everything happens.
+// Running traces: their set-up, their events, and the order of the steps.
 #include "tracing/RunnerFixture.h"
 
 namespace {
@@ -46,7 +46,7 @@ TEST_F(Runner, MakesNoTraceWithoutParametersAndSaysSo)
     EXPECT_EQ(platform.log.lines()[0].name, "TraceRunner");
 }
 
-TEST_F(Runner, MakesAnIntervalOfEveryPointWhateverItsType)
+TEST_F(Runner, MakesAnIntervalOfEveryPointOfAnyType)
 {
     add({.name = "all",
          .traceDataParams = {{"interval", TraceDataParams::interval, 1, 2, true},
@@ -134,7 +134,7 @@ TEST_F(Runner, DeliversEveryEventToEachOfItsTraces)
 
 TEST_F(Runner, ProcessesAllEventsThatWereDeliveredBeforeItsTraceEnded)
 {
-    constexpr std::uint64_t count = 20'000; // more than there is room for at first
+    constexpr std::uint64_t count = 20'000; // more than the first room
     add(interval("long", "interval"));
     runner->runTraces();
     for (std::uint64_t length = 1; length <= count; ++length)
@@ -220,7 +220,7 @@ TEST_F(Runner, CompletesATraceThatWasNeverRun)
     EXPECT_TRUE(file().closed);
 }
 
-// --- what goes wrong
+// --- failures
 
 TEST_F(Runner, SaysThatARangeCannotBeSetUpAndStartsAllTheSame)
 {
@@ -256,12 +256,13 @@ TEST_F(Runner, WaitsForeverForATraceThatIsNeverCompleted)
     EXPECT_THAT(platform.performanceWriter.files(), IsEmpty());
 }
 
-TEST_F(Runner, CompletesATraceForWhichThereIsNoKernelTrace)
+TEST_F(Runner, CompletesATraceWithoutAKernelTrace)
 {
     platform.kernelTrace.available = false;
     add(interval("one", "interval"));
     runner->runTraces();
-    EXPECT_THAT(platform.log.lines().at(3), IsLine(Error, "kert", "there is no kernel trace; one collects no events"));
+    EXPECT_THAT(platform.log.lines().at(3),
+                IsLine(Error, "kert", "the kernel trace is not available; one collects no events"));
     runner->stopTracingandProcessResults();
     EXPECT_EQ(runner->completedTraceCount(), 1U);
     EXPECT_THAT(file().measurements, IsEmpty());
@@ -291,7 +292,7 @@ TEST_F(Runner, LetsGoOfItsTracesWhenItIsDestroyedWhileTheyRun)
     emit(5);
     runner.reset();
     EXPECT_TRUE(session(0).destroyed);
-    platform.workQueues.runAll(); // what was delivered before still comes
+    platform.workQueues.runAll(); // events that were delivered before still come
     EXPECT_THAT(platform.log.lines(), IsEmpty());
     EXPECT_THAT(platform.performanceWriter.files(), IsEmpty());
 }

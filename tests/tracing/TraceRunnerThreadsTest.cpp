@@ -20,7 +20,7 @@ constexpr int cycles = 200;
 // A session emits intervals from a thread of its own, from its start to its end.
 class EmittingTrace final : public platform::KernelTrace {
 public:
-    // Of all sessions: they are delivered, or on their way to the queue.
+    // The number of events of all sessions that are delivered or on their way to the queue.
     std::atomic<std::uint64_t> intervals = 0;
 
     bool isAvailable() override { return true; }
@@ -74,7 +74,7 @@ private:
         std::function<void(const trace_point&)> handler_;
         std::shared_ptr<platform::WorkQueue> queue_;
         std::atomic<bool> hasEnded_ = false;
-        std::jthread thread_; // goes first
+        std::jthread thread_; // destroyed first
     };
 };
 

@@ -1,4 +1,4 @@
-// A trace and what it measures: arguments of single events, results by name, and the events in memory.
+// A trace and its measurements: arguments of single events, results by name, and the events in memory.
 #include "tracing/Trace.h"
 #include "support/TestPlatform.h"
 #include "support/fakes/FakeKernelTrace.h"
@@ -56,7 +56,7 @@ TEST_F(Point, CollectsNothingWithAnyOtherIndex)
     }
 }
 
-TEST_F(Point, CompletesNoIntervalSoThatItsAverageIsNoNumber)
+TEST_F(Point, CompletesNoIntervalSoThatItsAverageIsNotANumber)
 {
     TracePoint point("level", code, 1);
     EXPECT_TRUE(std::isnan(point.getAverageResult()));

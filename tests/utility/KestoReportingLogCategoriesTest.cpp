@@ -1,4 +1,4 @@
-// Tags are what a reader of the log filters by.
+// Readers of the log filter by these tags.
 #include "utility/KestoReportingLogCategories.h"
 
 #include <array>

@@ -1,5 +1,5 @@
-// The shared functions, each with the values that its users meet and with those at the edges; where two formulations of
-// the same thing exist, against each other.
+// The shared functions, each with common values and edge cases; two formulations of one function are compared with each
+// other.
 #include "utility/KestoReportingUtility.h"
 #include "support/TestPlatform.h"
 
@@ -106,13 +106,13 @@ TEST_F(ProcessName, InfoFillsTheEntryOnlyOfAProcessThatExists)
 
 // --- payloads
 
-TEST(AppName, IsUnknownWhenThereIsNone)
+TEST(AppName, IsUnknownWhenItIsMissing)
 {
     EXPECT_EQ(KestoReportingUtilityRetrieveAppName({}), Value("Unknown"));
     EXPECT_EQ(KestoReportingUtilityRetrieveAppName({{"hostapplicationdisplayid", "x"}}), Value("Unknown"));
 }
 
-TEST(AppName, IsWhateverIsStored)
+TEST(AppName, IsTheStoredValue)
 {
     EXPECT_EQ(KestoReportingUtilityRetrieveAppName({{"HostApplicationDisplayID", "org.player"}}), Value("org.player"));
     EXPECT_EQ(KestoReportingUtilityRetrieveAppName({{"HostApplicationDisplayID", 7}}), Value(7));
@@ -275,7 +275,7 @@ TEST(RoundWithPlaces, RoundsToTensAndHundredsWithNegativePlaces)
     EXPECT_EQ(KestoReportingUtilityRoundWithPlaces(15, -1), 20);
 }
 
-TEST(RoundWithPlaces, LeavesWhatIsNoNumberAsItIs)
+TEST(RoundWithPlaces, LeavesNaNAsItIs)
 {
     EXPECT_TRUE(std::isnan(KestoReportingUtilityRoundWithPlaces(std::nan(""), 2)));
     EXPECT_EQ(KestoReportingUtilityRoundWithPlaces(INFINITY, 2), INFINITY);
@@ -337,7 +337,7 @@ TEST(Buckets, AreShownRoundedHalfToEven)
     EXPECT_EQ(shown(1234567, 1), "1234567.0");
 }
 
-TEST(Buckets, ThatAreNoneGiveNothing)
+TEST(Buckets, ThatAreMissingGiveNothing)
 {
     EXPECT_EQ(KestoReportingUtilityBucketNumberToString(1, {}, 0), std::nullopt);
 }
@@ -348,7 +348,7 @@ TEST(Buckets, InNoOrderGiveTheFirstThatTheNextIsFartherThan)
     EXPECT_EQ(KestoReportingUtilityBucketNumberToString(1, std::array<double, 2>{3, 1}, 0), "1");
 }
 
-TEST(Buckets, GiveTheLastForWhatIsNoNumber)
+TEST(Buckets, GiveTheLastForNaN)
 {
     EXPECT_EQ(timeBucket(std::nan("")), "18000");
 }

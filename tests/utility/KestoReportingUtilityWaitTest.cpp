@@ -28,7 +28,7 @@ protected:
                                          KestoReportingTraceCategory());
     }
 
-    // Returns once so many other threads say that they wait, and hold the lock no more: they sleep then.
+    // Returns when so many other threads have logged that they wait and have released the lock: they then sleep.
     void letThemFallAsleep(std::size_t threads)
     {
         while (platform.log.lines().size() < threads)
@@ -49,7 +49,7 @@ TEST_F(WaitTest, ReturnsAtOnceWithoutAWordWhenTheFlagIsSet)
     EXPECT_THAT(platform.log.lines(), IsEmpty());
 }
 
-TEST_F(WaitTest, GivesUpAfterOneTimeoutWhenNobodySignals)
+TEST_F(WaitTest, GivesUpAfterOneTimeoutWithoutASignal)
 {
     const auto begun = std::chrono::steady_clock::now();
     EXPECT_FALSE(wait(aMoment));

@@ -1,4 +1,4 @@
-// Clients and stored events speak in these numbers and names: every one of them is held fast here.
+// Clients and stored events use these numbers and names, so these tests pin every one.
 #include "utility/KestoReportingVocabulary.h"
 
 #include <array>

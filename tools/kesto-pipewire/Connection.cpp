@@ -1,4 +1,4 @@
-// A class for each kind of object that is bound: its listener decodes what is heard and hands it to the graph.
+// A class for each kind of bound object: its listener decodes the object's events and passes them to the graph.
 #include "kesto-pipewire/Connection.h"
 
 #include "kesto-pipewire/Pods.h"
@@ -237,7 +237,7 @@ Connection::~Connection()
     pw_core_disconnect(core_);
 }
 
-// Errors of single objects say that they went, or had no format yet, when they were asked: no loss.
+// An error of a single object means that it has gone, or has no format yet; the connection goes on.
 void Connection::failed(ObjectID id, int error)
 {
     if (id == PW_ID_CORE && error == -EPIPE && lost_)

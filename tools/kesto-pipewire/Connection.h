@@ -1,7 +1,7 @@
 // One connection to a PipeWire server: its events, decoded and fed into a graph of streams.
 //
-// It only ever looks. It binds clients (for who they are), streams (for their state, volume and format), devices (for
-// their state) and, while a stream runs, the profiler (for cycles); links are told by the registry itself.
+// It only observes. It binds clients (for their identity), streams (for their state, volume and format), devices (for
+// their state) and, while a stream runs, the profiler (for cycles); the registry itself reports links.
 #pragma once
 
 #include "kesto-pipewire/Graph.h"
@@ -16,14 +16,14 @@
 
 namespace kesto_pipewire {
 
-// All of it on the thread of the context's loop. What it is given outlives it.
+// All functions run on the thread of the context's loop. Its arguments must outlive it.
 class Connection {
 public:
-    // An object of the server whose events are followed until this is destroyed.
+    // Follows the events of one object of the server until it is destroyed.
     class Bound;
 
-    // `lost` is called, once, when the server has gone; the connection is then to be destroyed, but not from
-    // within that call. Answers nothing when there is no such server.
+    // Calls `lost`, once, when the server has gone; the owner must then destroy the connection, but not from within
+    // that call. Returns null if the server is not running.
     [[nodiscard]] static std::unique_ptr<Connection> open(pw_context& context, const std::string& remote, Graph& graph,
                                                           std::function<void()> lost);
     ~Connection();
@@ -32,7 +32,7 @@ public:
 
     [[nodiscard]] Graph& graph() noexcept { return graph_; }
     [[nodiscard]] pw_registry* registry() noexcept { return registry_; }
-    // Whether streams run has changed, perhaps.
+    // Called when the running streams may have changed.
     void followProfiler();
 
 private:

@@ -1,4 +1,4 @@
-// The table of the channels, and the arithmetic between what PipeWire tells and what they count.
+// The table of the channels, and the conversion from PipeWire's events to their values.
 #include "kesto-pipewire/DeviceChannels.h"
 
 #include "kesto-pipewire/DriverName.h"
@@ -23,7 +23,7 @@ const std::vector<const char*> stateNames{"Suspended", "Idle", "Running", "Error
 
 // From a small fraction of the shortest cycle to beyond the longest.
 const std::vector<std::int64_t> workBounds{0, 20, 50, 100, 200, 500, 1000, 2000, 5000, 10000, 20000, 50000, 100000};
-// What nobody notices, up to what everybody does.
+// From delays that users do not notice to delays that all users notice.
 const std::vector<std::int64_t> startBounds{0, 1, 2, 5, 10, 20, 50, 100, 200, 500, 1000, 2000, 5000, 10000};
 
 const char* cycleGroup(Direction direction)
@@ -31,7 +31,7 @@ const char* cycleGroup(Direction direction)
     return direction == Direction::Output ? "Tx" : "Rx";
 }
 
-// What is left of a name in a file's name and in a report's key: names that differ in nothing else are one.
+// The part of a name that stays in a file's name and in a report's key: names with equal parts look alike.
 std::string essenceOf(std::string_view name)
 {
     constexpr unsigned char firstPrintable = 0x20;
@@ -45,7 +45,7 @@ std::string essenceOf(std::string_view name)
     return essence;
 }
 
-// Right after it was returned. Empty when all is well.
+// The text of a status; call it directly after the status was returned, because it reads `errno`. Empty on success.
 std::string reasonOf(kesto::Status status)
 {
     if (status == kesto::Status::Ok)
@@ -53,7 +53,7 @@ std::string reasonOf(kesto::Status status)
     return status == kesto::Status::SystemError ? std::generic_category().message(errno) : kesto::errorText(status);
 }
 
-// The first of several that failed.
+// The first failure of several calls.
 template <typename... Create> kesto::Status createAll(Create... create)
 {
     auto status = kesto::Status::Ok;
@@ -106,8 +106,8 @@ std::string DeviceChannels::describe(const std::string& reason) const
 std::string DeviceChannels::publishTotals()
 {
     kesto::PublisherOptions options;
-    options.root = root_; // where none is given, its place depends on what is there, and so on when it is opened
-    options.refreshInterval = std::chrono::milliseconds::max(); // `flush` tells how long states have lasted
+    options.root = root_; // without a root, libkesto chooses one when it opens
+    options.refreshInterval = std::chrono::milliseconds::max(); // `flush` writes the times of states
     if (auto reason = reasonOf(publisher_.open(options)); !reason.empty())
         return reason;
     auto [name, whyNotTheUsual] = driverNameIn(publisher_.root());
@@ -219,7 +219,7 @@ void DeviceChannels::deviceStateChanged(DeviceSerial serial, DeviceState state, 
         constexpr double millisecondsASecond = 1000;
         const auto wanted = std::exchange(device->wantedSince, std::nullopt);
         const auto milliseconds = std::llround((when.uptime - wanted->uptime) * millisecondsASecond);
-        const bool isStart = milliseconds <= startBounds.back(); // longer waits are those of somebody who has paused
+        const bool isStart = milliseconds <= startBounds.back(); // longer waits mean that a user has paused
         if (isStart && device->channels)
             device->channels->startTimes.record(milliseconds);
         if (isStart && totals_)

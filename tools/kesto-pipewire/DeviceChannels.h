@@ -1,12 +1,12 @@
-// What PipeWire's devices do, published as reporting channels: the service tells at the end of every session how they
-// changed over it.
+// Statistics of PipeWire's devices, published as reporting channels: the service reports at the end of every session
+// how they changed.
 //
-// Some channels are about all devices together and there from the beginning: the service follows only groups in which
-// there is a channel when it starts. The others are a device's, in a subgroup of its name, and come and go with it.
-// Devices may share a name: the second one's subgroup is "name#2", and stays that though the first one goes.
+// Some channels are about all devices together and exist from the beginning, because the service subscribes only to
+// groups that have a channel when it starts. The others belong to one device, in a subgroup of its name, and come and
+// go with it. Devices may share a name: the second device's subgroup is "name#2", even after the first has gone.
 //
-// What cannot be published, for want of a folder or of room, is tried again with each session and each new device;
-// reporting goes on without it.
+// If publishing fails, because a folder is missing or a limit is reached, it is tried again with each session and each
+// new device; reporting goes on without it.
 #pragma once
 
 #include "kesto-pipewire/Device.h"
@@ -21,13 +21,13 @@
 
 namespace kesto_pipewire {
 
-// All of it on one thread. The diagnostics outlive it.
+// All functions run on one thread. The diagnostics must outlive it.
 class DeviceChannels final : public DeviceListener {
 public:
-    // `root` is the channel tree; empty means where libkesto looks by default.
+    // `root` is the channel tree; empty means libkesto's default.
     DeviceChannels(std::string root, const Diagnostics& diagnostics);
 
-    // Has the files show what is so now, and publishes what could not be published before.
+    // Brings the files up to date, and tries again to publish channels that failed before.
     void flush();
 
     void deviceAppeared(DeviceSerial serial, const DeviceDescription& description) override;
@@ -37,7 +37,7 @@ public:
     void deviceGone(DeviceSerial serial) override;
 
 private:
-    // What is counted of cycles, for a device and for all devices of a direction.
+    // The channels of cycles, for a device and for all devices of a direction.
     struct CycleChannels {
         kesto::SimpleChannel cycles;
         kesto::SimpleChannel lateCycles;
@@ -59,16 +59,15 @@ private:
         Direction direction = Direction::Output;
         std::string subgroup;
         DeviceState state = DeviceState::Suspended;
-        std::optional<Moment> wantedSince; // while it is wanted and has not run since
+        std::optional<Moment> wantedSince; // since when it is wanted without running
         std::optional<DeviceOwnChannels> channels; // while it is published
     };
 
-    // Publish what is not published; all of the channels or none. The latter two answer why they could not, else
-    // nothing.
+    // Publish missing channels; all of a set or none. The latter two return the reason of a failure, or an empty text.
     void publish();
     [[nodiscard]] std::string publishTotals();
     [[nodiscard]] std::string publish(Device& device);
-    // Of the driver, and why it is not there.
+    // The text of the driver's place, and of the reason why it is not the usual one.
     [[nodiscard]] std::string place() const;
     [[nodiscard]] std::string describe(const std::string& reason) const;
 
@@ -80,8 +79,8 @@ private:
     void countRunning();
 
     const Diagnostics& diagnostics_;
-    const std::string root_; // as it was given
-    std::string problem_; // that was said last
+    const std::string root_; // the constructor's argument
+    std::string problem_; // the last reported one
     std::string driver_;
     kesto::Publisher publisher_;
     std::optional<TotalChannels> totals_; // while they are published

@@ -1,4 +1,4 @@
-// What the program says to whoever runs it: lines on standard error, which a service manager keeps.
+// The program's lines on standard error, which a service manager keeps.
 #pragma once
 
 #include <fmt/format.h>
@@ -14,12 +14,12 @@ public:
 
     [[nodiscard]] bool isVerbose() const noexcept { return isVerbose_; }
 
-    // Something that changes what is reported. Any thread, as the other one.
+    // A line about a change that affects the reports. Any thread, as the other function.
     template <typename... Values> void say(fmt::format_string<Values...> format, Values&&... values) const
     {
         fmt::print(stderr, "kesto-pipewire: {}\n", fmt::format(format, std::forward<Values>(values)...));
     }
-    // Something that only matters to who looks for it.
+    // A line that is only written with --verbose.
     template <typename... Values> void detail(fmt::format_string<Values...> format, Values&&... values) const
     {
         if (isVerbose_)

@@ -1,5 +1,4 @@
-// The tree may be written by everybody: what is in it is looked at, never followed, and believed only of this user's
-// own.
+// Every user may write to the tree: links in it are not followed, and only this user's own entries are trusted.
 #include "kesto-pipewire/DriverName.h"
 
 #include <fmt/format.h>
@@ -23,7 +22,7 @@ std::optional<uid_t> ownerOf(const std::filesystem::path& path)
     return ::lstat(path.c_str(), &status) == 0 ? std::optional(status.st_uid) : std::nullopt;
 }
 
-// Of the user's names in the tree the first that begins like that; else one that nobody knows yet.
+// The first of the user's names in the tree with that beginning; else a new random name.
 std::string unforeseeableName(const std::filesystem::path& root, const std::string& begin)
 {
     std::error_code error;

@@ -1,9 +1,9 @@
-// What the driver is called under which a user's devices are published, and why it may be in vain.
+// The name of the driver for a user's devices, and the reasons why publishing may fail.
 //
 // Every user of a system's service may publish, so every user has a driver: "pipewire-1000" is that of user 1000.
-// Anybody could be there first with that name. What belongs to somebody else is left alone, and the driver is called
-// "pipewire-1000<5f3a9c01>", which nobody can foresee and which reports cut at the "<". A name of that kind that this
-// user has already is used again, so that what was left there is taken over.
+// Another user could take that name first. A folder of another user is left alone, and the driver is then called
+// "pipewire-1000<5f3a9c01>", which other users cannot predict and which reports cut at the "<". If this user already
+// has a name of that kind, it is used again, so that its old files are removed.
 #pragma once
 
 #include <sys/types.h>
@@ -15,13 +15,13 @@ namespace kesto_pipewire {
 
 struct DriverName {
     std::string name{};
-    std::string reason{}; // in words, why it is not the usual one; empty if it is
+    std::string reason{}; // why it is not the usual name; empty if it is
 };
 
-// For the user that this process is. Any thread.
+// The name for this process's user. Any thread.
 [[nodiscard]] DriverName driverNameIn(const std::filesystem::path& root);
 
-// Which folder stands in the way of publishing there, whose it is, and what can be done; a sentence. Any thread.
+// A sentence that names the folder that prevents publishing, its owner, and what to do. Any thread.
 [[nodiscard]] std::string adviceOn(const std::filesystem::path& root, const std::string& driver);
 
 // "kesto", or "user 1234" for one without a name. Any thread.

@@ -1,4 +1,4 @@
-// The folder is watched, as a file that is not there yet cannot be.
+// Watches the folder, because a missing file cannot be watched.
 #include "kesto-pipewire/FileWatch.h"
 
 #include <sys/inotify.h>

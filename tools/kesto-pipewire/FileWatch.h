@@ -1,5 +1,4 @@
-// Waiting for a file to appear without asking for it again and again: whoever lost a server learns at once
-// that its socket is back.
+// Waits without polling for a file to appear: so the program learns at once that a lost server's socket is back.
 #pragma once
 
 #include "kesto-pipewire/Loop.h"
@@ -9,8 +8,8 @@
 
 namespace kesto_pipewire {
 
-// Calls each time that the file is made or moved to its place. Does nothing where its folder cannot be watched,
-// as when it does not exist: who needs certainty has a timer too. On the loop's thread.
+// Calls back each time that the file is made or moved to its place. Does nothing if its folder cannot be watched, for
+// example because it is missing; so its user needs a timer, too. On the loop's thread.
 class FileWatch {
 public:
     FileWatch(Loop& loop, const std::filesystem::path& file, std::function<void()> appeared);

@@ -1,5 +1,5 @@
-// Nodes, links and clients by their IDs. What is told of a stream or a device is worked out from the links anew each
-// time: there are few, and nothing can get out of step.
+// Nodes, links and clients by their IDs. The state of a stream or device is computed from the links each time: there
+// are few links, and so the state is always consistent.
 #include "kesto-pipewire/Graph.h"
 
 #include "kesto-pipewire/Text.h"
@@ -23,7 +23,7 @@ std::optional<Direction> directionOfClass(std::string_view mediaClass)
     return std::nullopt;
 }
 
-// What takes sound and gives it counts by what it takes.
+// A device that both takes and gives sound counts as one that takes it.
 std::optional<Direction> directionOfDevice(std::string_view mediaClass)
 {
     if (mediaClass == "Audio/Sink" || mediaClass == "Audio/Duplex")
@@ -58,7 +58,7 @@ Graph::Interest Graph::addNode(ObjectID id, const NodeAnnouncement& announcement
         ++streams_;
         return Interest::Stream;
     }
-    if (!hasRoom(devices_, maximumDevices)) // it still has a name, which streams are told
+    if (!hasRoom(devices_, maximumDevices)) // streams still get its name
         return Interest::None;
     ++devices_;
     node.isDevice = true;
@@ -98,7 +98,8 @@ void Graph::removeNode(ObjectID id, Moment when)
     if (node.isDevice)
         deviceListener_.deviceGone(node.serial);
 
-    // Links go before their nodes; one that did not must not tie the ID's next owner to this one's partners.
+    // Links go before their nodes. A link that did not go must not connect the ID's next owner with this node's
+    // partners.
     std::set<ObjectID> partners;
     std::erase_if(links_, [&](const auto& entry) {
         const auto& link = entry.second;
@@ -119,7 +120,7 @@ void Graph::endStreams(Moment when)
 
 void Graph::clear(Moment when)
 {
-    endStreams(when); // before the devices, whose statistics belong to the streams' sessions
+    endStreams(when); // before the devices, because their statistics belong to the streams' sessions
     for (const auto& [id, node] : nodes_)
         if (node.isDevice)
             deviceListener_.deviceGone(node.serial);
@@ -217,7 +218,7 @@ void Graph::noteCycle(const Cycle& cycle)
     }
 }
 
-// Of what is neither stream nor device, and of what is gone, nobody knows: it takes part.
+// The state of other objects and of removed ones is unknown: they count as running.
 bool Graph::isSettingOff(ObjectID id, Moment when) const
 {
     const auto found = nodes_.find(id);
@@ -235,7 +236,7 @@ void Graph::tellCycle(const NodeCycle& cycle)
 
 std::string Graph::devicesOf(ObjectID id) const
 {
-    std::set<std::string_view> names; // a link a channel: the same device many times
+    std::set<std::string_view> names; // each channel has a link, so a device may come several times
     for (const auto& [ignored, link] : links_)
         if (link.touches(id))
             if (const auto peer = nodes_.find(link.outputNode == id ? link.inputNode : link.outputNode);

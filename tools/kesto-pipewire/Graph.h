@@ -1,9 +1,8 @@
-// The part of PipeWire's object graph that concerns sound: who plays, on whose behalf, linked with what, and what the
-// devices do.
+// The part of PipeWire's object graph that concerns sound: streams, their applications and links, and devices.
 //
-// The server tells of objects one by one, under IDs that it uses again at once. This keeps just enough of
-// them to turn those tellings into changes of streams and devices. It is plain data and knows nothing of libpipewire,
-// so that every order of events can be tried without a server. All of it on one thread.
+// The server reports objects one by one, under IDs that it uses again at once. The graph keeps just enough of them to
+// turn these reports into changes of streams and devices. It is plain data and does not depend on libpipewire, so that
+// tests can try every order of events without a server. All functions run on one thread.
 #pragma once
 
 #include "kesto-pipewire/Device.h"
@@ -17,21 +16,21 @@
 
 namespace kesto_pipewire {
 
-// Any client of PipeWire can make objects; beyond these numbers they are left aside and counted.
+// Any client of PipeWire can make objects; beyond these numbers they are ignored and counted.
 constexpr std::size_t maximumStreams = 512;
 constexpr std::size_t maximumDevices = 128;
 constexpr std::size_t maximumObjects = 16384; // of each kind
 
-constexpr double startUpTime = 0.2; // seconds; cycles that a node misses so soon after setting off are no fault
+constexpr double startUpTime = 0.2; // seconds; cycles that a node misses so soon after its start do not count
 
-// Who a program says it is, on its client object, its node or both.
+// A program's own description, on its client object, its node or both.
 struct Identity {
     std::string applicationID{}; // `application.id`
     std::string binary{}; // `application.process.binary`
     std::string name{}; // `application.name`
 };
 
-// What the server announces of a node.
+// The server's announcement of a node.
 struct NodeAnnouncement {
     StreamSerial serial = 0;
     std::string_view mediaClass{};
@@ -47,33 +46,33 @@ public:
     {
     }
 
-    // What the further events of a node are wanted for.
+    // The kind of node whose further events are needed.
     enum class Interest : std::uint8_t { None, Stream, Device };
     [[nodiscard]] Interest addNode(ObjectID node, const NodeAnnouncement& announcement);
     void addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Moment when);
-    // An object of any kind is gone.
+    // An object of any kind was removed.
     void remove(ObjectID object, Moment when);
-    // Every stream counts as gone; the devices stay.
+    // Removes every stream; the devices stay.
     void endStreams(Moment when);
-    // The server is gone, and everything with it.
+    // The server has gone: removes all objects.
     void clear(Moment when);
 
     void describeClient(ObjectID client, Identity identity);
-    // The first description of a stream is its appearance; the others say nothing new.
+    // The first description of a stream is its appearance; later ones are ignored.
     void describeNode(ObjectID node, const Identity& identity, std::string_view role, Moment when);
 
-    // Of nodes that have not appeared as streams these are ignored.
+    // Ignored for nodes that have not appeared as streams.
     void setRunning(ObjectID node, bool running, Moment when);
     void setVolume(ObjectID node, double volume, Moment when);
     void setFormat(ObjectID node, const StreamFormat& format, Moment when);
-    // Of nodes that are no devices it is ignored.
+    // Ignored for nodes that are not devices.
     void setDeviceState(ObjectID node, DeviceState state, Moment when);
-    // Tells the devices of their cycles and the streams of those that they were late in; a driver was late when any
-    // that follows it was. It is told in arrears: an ID may be another node's by now, whose cycles began later.
+    // Reports its cycles to each device, and late cycles to the streams; a driver was late if one of its followers was.
+    // The report comes later than the cycle: an ID may belong to another node by now, whose cycles began later.
     void noteCycle(const Cycle& cycle);
 
     [[nodiscard]] bool anyStreamRuns() const noexcept { return runningStreams_ > 0; }
-    // Objects left aside because there were too many.
+    // How many objects were ignored because there were too many.
     [[nodiscard]] std::uint64_t ignoredObjects() const noexcept { return ignoredObjects_; }
 
 private:

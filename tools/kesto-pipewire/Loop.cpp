@@ -1,5 +1,5 @@
-// PipeWire's loop calls back with a pointer. What that points to lives until the callback has returned, though the
-// callback may let go of its own source.
+// PipeWire's loop calls back with a pointer. Its target lives until the callback has returned, even if the callback
+// destroys its own source.
 #include "kesto-pipewire/Loop.h"
 
 #include <pipewire/loop.h>
@@ -27,7 +27,7 @@ struct Source::Watched : std::enable_shared_from_this<Watched> {
     }
     static void fire(void* data)
     {
-        const auto self = static_cast<Watched*>(data)->shared_from_this(); // the callback may let go of it
+        const auto self = static_cast<Watched*>(data)->shared_from_this(); // the callback may destroy the source
         self->callback();
     }
 
@@ -78,7 +78,7 @@ pw_loop* Loop::raw() const noexcept
     return pw_main_loop_get_loop(loop_.get());
 }
 
-// What the four kinds of source have in common; `start` makes the loop's own source with the given data.
+// The common part of the four kinds of source; `start` makes the loop's own source with the given data.
 template <typename Start> Source Loop::watch(Source::Callback callback, Start start)
 {
     auto watched = std::make_shared<Source::Watched>(raw(), std::move(callback));

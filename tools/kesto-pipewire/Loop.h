@@ -1,5 +1,5 @@
-// The one event loop of the program: PipeWire's own, so that its events, our timers and the system's signals
-// take turns on one thread and nothing needs a lock.
+// The one event loop of the program: PipeWire's own, so that its events, the program's timers and the system's signals
+// take turns on one thread and need no lock.
 #pragma once
 
 #include <cstdint>
@@ -12,7 +12,7 @@ struct spa_source;
 
 namespace kesto_pipewire {
 
-// Something that the loop watches; no longer than this object lives. May be destroyed within its own call.
+// The loop watches a source as long as this object lives. May be destroyed within its own call.
 class Source {
 public:
     using Callback = std::function<void()>;
@@ -30,28 +30,28 @@ private:
     std::shared_ptr<Watched> watched_;
 };
 
-// All of it on the loop's thread, but for `wake`.
+// All functions except `wake` run on the loop's thread.
 class Loop {
 public:
-    // Throws std::system_error when the system grants no loop.
+    // Throws std::system_error if the system refuses a loop.
     Loop();
     ~Loop();
     Loop(const Loop&) = delete;
     Loop& operator=(const Loop&) = delete;
 
-    // Until `quit` is called.
+    // Runs until `quit` is called.
     void run();
     void quit();
 
-    // A timer does nothing until `arm`; then it calls once, after that many seconds.
+    // A timer does nothing until `arm`; then it calls back once, after that many seconds.
     [[nodiscard]] Source addTimer(Source::Callback callback);
     void arm(Source& timer, double seconds);
     void disarm(Source& timer);
 
     [[nodiscard]] Source addSignal(int signal, Source::Callback callback);
-    // Calls whenever the descriptor can be read. The descriptor stays the caller's.
+    // Calls back whenever the descriptor can be read. The caller keeps the descriptor.
     [[nodiscard]] Source addReadable(int descriptor, Source::Callback callback);
-    // Calls after `wake`, which any thread may use.
+    // Calls back after `wake`, which any thread may use.
     [[nodiscard]] Source addWakeup(Source::Callback callback);
     void wake(Source& wakeup);
 

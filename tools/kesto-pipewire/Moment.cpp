@@ -1,5 +1,5 @@
-// The uptime is that of CLOCK_BOOTTIME, which goes on while the device sleeps; CLOCK_MONOTONIC does not, so that what
-// is told on it only says how long ago it was.
+// The uptime is that of CLOCK_BOOTTIME, which goes on while the device sleeps. CLOCK_MONOTONIC does not, so a time on
+// it only gives the time that has passed since.
 #include "kesto-pipewire/Moment.h"
 
 #include <ctime>

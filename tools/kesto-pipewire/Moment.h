@@ -1,4 +1,4 @@
-// When something happened, on the two clocks that reports need.
+// The time of an event, on the two clocks that reports need.
 #pragma once
 
 #include <cstdint>

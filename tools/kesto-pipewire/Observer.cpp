@@ -1,5 +1,5 @@
-// A server that goes is noticed inside a callback of its connection, which cannot be taken down from there: so the loss
-// is noted with its time, and dealt with in the loop's next turn.
+// The loss of a server is noticed inside a callback of its connection, which must not destroy the connection: so the
+// callback notes the time of the loss, and the loop's next turn handles it.
 #include "kesto-pipewire/Observer.h"
 
 #include "platform/linux/process/Environment.h"
@@ -17,8 +17,8 @@ namespace kesto_pipewire {
 
 namespace {
 
-// A server that is being started is there within the first pauses; one that is not there at all costs two
-// wake-ups a minute, should its socket's appearance go unnoticed.
+// A starting server is ready within the first pauses; without a server the program wakes up twice a minute, in case it
+// misses the socket's appearance.
 constexpr double firstPause = 0.1;
 constexpr double longestPause = 30;
 
@@ -51,7 +51,7 @@ Observer::Observer(Loop& loop, std::string remote, StreamListener& listener, Dev
       retry_(loop.addTimer([this] { connect(); })),
       loss_(loop.addWakeup([this] { serverWasLost(); })),
       pause_(firstPause)
-      // No configuration file: what an ordinary client loads is for streams of its own.
+      // No configuration file: an ordinary client loads it for streams of its own.
       ,
       context_(pw_context_new(loop.raw(), pw_properties_new(PW_KEY_CONFIG_NAME, "null", nullptr), 0))
 {
@@ -76,7 +76,7 @@ void Observer::stop()
     connection_.reset();
     graph_.endStreams(currentMoment());
     if (const auto ignored = graph_.ignoredObjects())
-        diagnostics_.say("{} of PipeWire's objects were left aside, being too many at once", ignored);
+        diagnostics_.say("{} of PipeWire's objects were ignored, because there were too many at once", ignored);
 }
 
 void Observer::connect()
@@ -101,7 +101,7 @@ void Observer::waitForServer()
         diagnostics_.say("waiting for PipeWire at {}", socketPath(remote_).string());
         socketWatch_.emplace(loop_, socketPath(remote_), [this] {
             pause_ = firstPause;
-            loop_.arm(retry_, 0); // later: this watch cannot be taken down from within its own callback
+            loop_.arm(retry_, 0); // later, because this watch must not be destroyed from within its own callback
         });
     }
     loop_.arm(retry_, pause_);

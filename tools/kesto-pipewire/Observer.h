@@ -1,7 +1,7 @@
-// Keeps a connection to PipeWire and tells what happens to its streams and devices, whatever happens to the server.
+// Keeps a connection to PipeWire, across restarts of the server, and reports changes of its streams and devices.
 //
-// When the server goes, every stream goes with it, and the observer waits for the next one: the appearance
-// of its socket wakes it at once, a timer with growing pauses covers what that misses.
+// When the server goes, every stream goes with it, and the observer waits for the next server: the appearance of its
+// socket wakes the observer at once, and a timer with growing pauses covers a missed appearance.
 #pragma once
 
 #include "kesto-pipewire/Connection.h"
@@ -19,20 +19,20 @@ struct pw_context;
 
 namespace kesto_pipewire {
 
-// All of it on the loop's thread. The loop, the listeners and the diagnostics outlive it.
+// All functions run on the loop's thread. The loop, the listeners and the diagnostics must outlive it.
 class Observer {
 public:
-    // `remote` is a server's name or its socket's path; empty means what PipeWire's programs use by default.
-    // Throws std::system_error when PipeWire's library cannot be set up.
+    // `remote` is a server's name or its socket's path; empty means the default of PipeWire's programs. Throws
+    // std::system_error if PipeWire's library cannot be set up.
     Observer(Loop& loop, std::string remote, StreamListener& listener, DeviceListener& deviceListener,
              const Diagnostics& diagnostics);
     ~Observer();
     Observer(const Observer&) = delete;
     Observer& operator=(const Observer&) = delete;
 
-    // Connects, now or as soon as there is a server, and again whenever it comes back.
+    // Connects, now or when a server starts, and again whenever it comes back.
     void start();
-    // Ends the observation: every stream is told to be gone.
+    // Ends the observation: reports every stream as gone.
     void stop();
 
 private:
@@ -49,7 +49,7 @@ private:
     const Diagnostics& diagnostics_;
     Graph graph_;
     Source retry_;
-    Source loss_; // a connection cannot be taken down from within its own callback
+    Source loss_; // a connection must not be destroyed from within its own callback
     Moment lostAt_;
     double pause_;
     std::optional<FileWatch> socketWatch_;

@@ -1,5 +1,5 @@
-// What a pod claims of its type, its size and its number of elements is looked at before anything is taken from it:
-// clients of PipeWire write these.
+// A pod's type, size and number of elements are checked before its content is read, because clients of PipeWire write
+// these.
 #include "kesto-pipewire/Pods.h"
 
 #include <spa/debug/types.h>
@@ -57,7 +57,7 @@ std::optional<float> readLoudestChannel(const spa_pod& properties)
 {
     std::array<float, SPA_AUDIO_MAX_CHANNELS> amplitudes{};
     const auto* pod = findProperty(properties, SPA_PROP_channelVolumes);
-    // Copying trusts what the array says of its elements' size.
+    // Copying relies on the array's own element size, so it is checked.
     if (!pod || !spa_pod_is_array(pod) || SPA_POD_ARRAY_VALUE_SIZE(pod) != sizeof(float))
         return std::nullopt;
     const auto count = spa_pod_copy_array(pod, SPA_TYPE_Float, amplitudes.data(), amplitudes.size());
@@ -72,14 +72,14 @@ std::string shortName(const spa_type_info* types, std::uint32_t type)
     return name ? name : "unknown";
 }
 
-// One node's part of a cycle, as the profiler tells it.
+// One node's part of a cycle in the profiler's record.
 struct Block {
     std::int32_t node = 0;
-    std::int64_t signalBefore = 0; // when it was last told to begin, before this one
-    std::int64_t signal = 0; // when it was told to
-    std::int64_t awake = 0; // when it did
+    std::int64_t signalBefore = 0; // the previous signal to begin
+    std::int64_t signal = 0; // this signal to begin
+    std::int64_t awake = 0; // when it woke up
     std::int64_t finish = 0;
-    std::int32_t status = 0; // how far it came
+    std::int32_t status = 0; // the step that it reached
 };
 
 std::optional<Block> readBlock(const spa_pod& pod)
@@ -100,7 +100,7 @@ std::optional<Block> readBlock(const spa_pod& pod)
     return block;
 }
 
-// Times of which one is not of this cycle, since the node has not come so far in it, are the cycle's before.
+// A time belongs to an earlier cycle if the node has not reached that step in this cycle.
 std::optional<std::int64_t> workOf(const Block& block)
 {
     const bool isOfThisCycle = block.awake > 0 && block.awake >= block.signal && block.finish >= block.awake;
@@ -148,7 +148,7 @@ template <typename Visit> void forEachMember(const spa_pod& structure, Visit vis
 
 double userVolume(double amplitude)
 {
-    if (!(amplitude > 0)) // nor a number at all
+    if (!(amplitude > 0)) // also false for NaN
         return 0;
     return std::round(std::min(std::cbrt(amplitude), 1.0) * 1e4) / 1e4;
 }
@@ -207,9 +207,9 @@ void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>&
         if (!began || (driver && driver->signal == driver->signalBefore))
             return;
         cycle.began = *began;
-        if (driver) { // the clock of a cycle that was missed is the next one's already
+        if (driver) { // the record of a missed cycle already has the next cycle's clock
             cycle.began = driver->signal;
-            cycle.driver = nodeCycleOf(*driver, false); // its own status is that of a cycle which is just being told
+            cycle.driver = nodeCycleOf(*driver, false); // its own status is that of the cycle that is being reported
         }
         tell(cycle);
     });

@@ -1,4 +1,4 @@
-// Reading of what PipeWire says in its own binary values ("pods"): volumes, formats and cycles.
+// Reads PipeWire's binary values ("pods"): volumes, formats and cycles.
 #pragma once
 
 #include "kesto-pipewire/Device.h"
@@ -17,14 +17,14 @@ namespace kesto_pipewire {
 // 1. Four decimals, so that equal positions of a slider make equal numbers. Any thread.
 [[nodiscard]] double userVolume(double amplitude);
 
-// The volume that a node's properties hold, 0 when muted; nothing when they hold none. Any thread.
+// The volume in a node's properties, 0 when muted; nothing if they hold none. Any thread.
 [[nodiscard]] std::optional<double> readVolume(const spa_pod& properties);
 
-// The audio format, or nothing when the value holds none, as when the stream is suspended. Any thread.
+// The audio format, or nothing if the value holds none, as for a suspended stream. Any thread.
 [[nodiscard]] std::optional<StreamFormat> readFormat(const spa_pod& format);
 
-// Calls back for every cycle that the profiler tells of. What it tells of again without the driver having begun anew,
-// as it does when a driver sets off after a pause or a cycle was missed, is none. Any thread.
+// Calls back for every cycle that the profiler reports. A record without a new signal for the driver, which comes when
+// a driver starts after a pause or a cycle was missed, is not a cycle. Any thread.
 void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& tell);
 
 } // namespace kesto_pipewire

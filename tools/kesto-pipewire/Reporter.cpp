@@ -1,5 +1,5 @@
-// Three steps, and none knows the others: what is heard is noted as pending, what is pending is found due or not, and
-// what is due is told in the order in which it happened.
+// Three independent steps: events become pending changes; pending changes become due; due changes are reported in the
+// order in which they happened.
 #include "kesto-pipewire/Reporter.h"
 
 #include <algorithm>
@@ -76,7 +76,7 @@ Reporter::Reporter(ReportingService& service, ReporterID firstID, Alarm alarm, B
 {
 }
 
-// Hearing of streams.
+// Events of streams.
 
 template <typename Action> void Reporter::update(StreamSerial serial, Moment when, Action action)
 {
@@ -103,7 +103,7 @@ void Reporter::runningChanged(StreamSerial serial, bool running, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
         if (!running && stream.running.current && !stream.running.told)
-            tellChanges(stream, infinity); // it did run, however short
+            tellChanges(stream, infinity); // even the shortest run is reported
         stream.running.observe(running, when);
     });
 }
@@ -139,7 +139,7 @@ void Reporter::gone(StreamSerial serial, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
         if (stream.devices.current.empty())
-            stream.devices.current = stream.devices.told; // its links went with it
+            stream.devices.current = stream.devices.told; // its links have gone with it
         tellChanges(stream, infinity);
         stream.running.observe(false, when);
         tellChanges(stream, infinity);
@@ -149,7 +149,7 @@ void Reporter::gone(StreamSerial serial, Moment when)
     setAlarm();
 }
 
-// Deciding what is due.
+// Due changes.
 
 Reporter::Changes Reporter::changesOf(const Stream& stream)
 {
@@ -167,9 +167,9 @@ Reporter::Changes Reporter::changesOf(const Stream& stream)
     add(running, &Reporter::tellRunning, running.changedAt,
         running.changedAt.uptime + (startsAtOnce ? 0 : settlingTime));
     if (stream.runs == 0)
-        return changes; // the first start will tell the rest
+        return changes; // the first Start reports the others
 
-    // A stream whose device goes stops for it, a moment later; but what it stopped on is that device.
+    // A stream stops a moment after its device has gone; its Stop still names that device.
     const auto stopsForIt = devices.current.empty() && running.isPending() && !running.current;
     const auto moved = stopsForIt ? later(devices.changedAt, running.changedAt) : devices.changedAt;
     add(volume, &Reporter::tellVolume, volume.changedAt,
@@ -182,7 +182,7 @@ Reporter::Changes Reporter::changesOf(const Stream& stream)
 std::optional<double> Reporter::changesDue(const Stream& stream)
 {
     const auto changes = changesOf(stream);
-    return changes.empty() ? std::nullopt : std::optional(changes.front().due); // the others wait for their turn
+    return changes.empty() ? std::nullopt : std::optional(changes.front().due); // later changes wait for it
 }
 
 std::optional<double> Reporter::episodeDue(const Stream& stream)
@@ -217,7 +217,7 @@ void Reporter::setAlarm()
         alarm_(time);
 }
 
-// Telling it.
+// Reports.
 
 void Reporter::tellChanges(Stream& stream, double dueUntil)
 {
@@ -281,7 +281,7 @@ void Reporter::sendRunning(const Stream& stream, Moment when)
     message.emplace_back("active_devices", devicesText(stream.devices.told));
     if (stream.volume.told)
         message.emplace_back("PomoSessionVolume", *stream.volume.told);
-    // Without it a second start would be the first's repetition, and those are dropped.
+    // Without it a second Start would repeat the first, and the service drops repetitions.
     message.emplace_back("session_run", stream.runs);
     send(stream, stream.category(), stream.running.told ? EventType::Start : EventType::Stop, std::move(message), when);
 }
@@ -302,8 +302,8 @@ void Reporter::serviceAppeared()
     serviceIsThere_ = true;
     for (const auto& [serial, stream] : streams_) {
         openSession(stream);
-        // The state is told with the time since which it has held unchanged: what came before, the service
-        // was told when it was last there.
+        // The state is reported with the time since which it has not changed; the service got all earlier changes
+        // before it went.
         if (stream.running.told)
             sendRunning(stream,
                         later(later(stream.running.toldSince, stream.volume.toldSince),

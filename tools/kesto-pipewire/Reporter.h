@@ -1,9 +1,9 @@
-// What is reported of streams, and when: one session a stream, from its appearance to its end.
+// Reports streams: one session for each stream, from its appearance to its end.
 //
-// PipeWire tells every step, the reporter what a listener would notice. When a device is plugged in, streams
-// stop, lose their links, get new ones and run again within a few milliseconds; that is a change of route and
-// no pause. So a change waits a moment for what follows it, and what has come undone by then never happened.
-// What did happen is told in the order and with the times at which it happened, however late.
+// PipeWire reports every step, the reporter only changes that a listener would notice. When a device is plugged in,
+// streams stop, lose their links, get new ones and run again within a few milliseconds; that is a change of route, not
+// a pause. So a change waits a moment, and is dropped if it is undone by then. Other changes are reported in their
+// order and with the times at which they happened.
 //
 // Pure logic: no clock, no sockets. All of it on one thread.
 #pragma once
@@ -22,28 +22,28 @@
 namespace kesto_pipewire {
 
 // Seconds.
-constexpr double settlingTime = 0.1; // a stop, a device or a format counts when it has lasted that long
-constexpr double volumeInterval = 0.1; // a slider on the move is told no more often
-constexpr double longestHold = 1; // what never settles is told as it is after that long
-constexpr double quietTime = 2; // an episode of late cycles ends when there was none for that long
-constexpr double longestEpisode = 60; // trouble without end is told once in that time
+constexpr double settlingTime = 0.1; // a stop, a device or a format counts after it has lasted this long
+constexpr double volumeInterval = 0.1; // the shortest time between two reports of a moving slider
+constexpr double longestHold = 1; // a change that never settles is reported after this time
+constexpr double quietTime = 2; // an episode of late cycles ends after this time without one
+constexpr double longestEpisode = 60; // a longer episode is reported in parts of this length
 
 class Reporter : public StreamListener {
 public:
-    // Tells when `settle` is to be called next, as an uptime; nothing means not before something happens.
+    // Gets the uptime of the next call of `settle`; nothing means that none is needed before the next event.
     using Alarm = std::function<void(std::optional<double> uptime)>;
-    // Called before a session starts or ends, when the service samples what the devices have done.
+    // Called before a session starts or ends, because the service then samples the devices' channels.
     using BeforeSampling = std::function<void()>;
 
-    // Sessions get the IDs from `firstID` upwards, which is greater than 0. The service outlives this.
+    // Sessions get the IDs from `firstID` upwards, which is greater than 0. The service must outlive the reporter.
     Reporter(ReportingService& service, ReporterID firstID, Alarm alarm, BeforeSampling beforeSampling = [] { });
 
-    // The service can be reached from now on and knows nothing: every stream gets a session that begins with
-    // the state it is in. Without a service, streams are followed and nothing is reported.
+    // From now on the service can be reached, and has no sessions: every stream gets a session that begins with its
+    // present state. Without a service the reporter follows streams but does not report.
     void serviceAppeared();
     void serviceLost();
 
-    // Reports what is due.
+    // Reports due changes.
     void settle(Moment now);
 
     void appeared(StreamSerial serial, const StreamDescription& description, Moment when) override;
@@ -55,13 +55,13 @@ public:
     void gone(StreamSerial serial, Moment when) override;
 
 private:
-    // Something that changes: as it is, and as it was last told.
+    // A value that changes: the current one and the last reported one.
     template <typename Value> struct Fact {
         Value current{};
         Value told{};
-        Moment changedAt; // when it became what it is
-        Moment toldSince; // since when it is so, by what was told
-        Moment pendingSince; // since when it is not what was told
+        Moment changedAt; // when the current value began
+        Moment toldSince; // when the reported value began
+        Moment pendingSince; // since when the two differ
 
         void observe(Value value, Moment when)
         {
@@ -94,18 +94,18 @@ private:
         Fact<std::optional<double>> volume;
         Fact<std::optional<StreamFormat>> format;
         Fact<std::string> devices;
-        std::int64_t runs = 0; // how often it has begun to run
+        std::int64_t runs = 0; // how often it has started to run
         std::optional<Episode> episode;
 
         [[nodiscard]] bool isKnownWhole() const;
         [[nodiscard]] Category category() const;
     };
 
-    // A difference between what is and what was told.
+    // A difference between a current and a reported value.
     struct Change {
         void (Reporter::*tell)(Stream&, Moment);
         Moment when;
-        double due = 0; // not to be told before, as an uptime; nor before those that happened before
+        double due = 0; // the earliest uptime of its report; earlier changes go first
     };
     using Changes = std::vector<Change>; // in the order in which they happened
 
@@ -113,7 +113,7 @@ private:
     [[nodiscard]] static std::optional<double> changesDue(const Stream& stream);
     [[nodiscard]] static std::optional<double> episodeDue(const Stream& stream);
 
-    // Runs the action on the stream, if it is known, reports what is then due and sets the alarm.
+    // Runs the action on the stream, if it is known, reports due changes and sets the alarm.
     template <typename Action> void update(StreamSerial serial, Moment when, Action action);
     void setAlarm();
 
@@ -139,7 +139,7 @@ private:
     std::map<StreamSerial, Stream> streams_;
 };
 
-// The service type that stands for a `media.role`.
+// The service type of a `media.role`.
 [[nodiscard]] ServiceType serviceTypeOfRole(std::string_view role);
 
 } // namespace kesto_pipewire

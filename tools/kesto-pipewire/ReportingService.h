@@ -1,6 +1,6 @@
 // The reporting service as the reporter sees it: the operations on one session.
 //
-// An interface, so that what is reported can be tested without a service.
+// An interface, so that the reporter can be tested without a service.
 #pragma once
 
 #include <kesto/kesto.hpp>
@@ -23,7 +23,7 @@ using kesto::ServiceType;
 using PayloadValue = std::variant<bool, std::int64_t, double, std::string>;
 using Payload = std::vector<std::pair<std::string_view, PayloadValue>>;
 
-// Calls take effect in their order, some time later; none fails towards the caller.
+// Calls take effect in their order, some time later; they do not report failures to the caller.
 class ReportingService {
 public:
     virtual ~ReportingService() = default;

@@ -1,4 +1,4 @@
-// libkesto's callbacks come on its own thread: they leave word of the state, and the loop's next turn reads it.
+// libkesto's callbacks come on its own thread: they store the state, and the loop's next turn reads it.
 #include "kesto-pipewire/ServiceConnection.h"
 
 #include "utility/KestoReportingVocabulary.h"
@@ -13,10 +13,10 @@ namespace kesto_pipewire {
 
 namespace {
 
-constexpr std::size_t queueBytes = 1024 * 1024; // some thousands of messages, should the service be slow
+constexpr std::size_t queueBytes = 1024 * 1024; // some thousands of messages, for a slow service
 constexpr auto longestFarewell = std::chrono::seconds(3);
 
-// In the kernel's trace, with the session as argument: it is told that a stream begins to run, and that it ceases to.
+// Codes in the kernel's trace, with the session as argument: Start and Stop of a stream.
 constexpr std::uint32_t streamBegins = 0x21044080;
 constexpr std::uint32_t streamCeases = 0x21044084;
 
@@ -62,7 +62,7 @@ void ServiceConnection::open(Handlers handlers)
 bool ServiceConnection::close()
 {
     if (!isConnected_)
-        return true; // nobody was told anything that now lacks its end
+        return true; // no started session lacks its end
     const auto status = client_.close(longestFarewell);
     if (status != kesto::Status::Ok)
         diagnostics_.say("the last messages may not have reached the reporting service: {}", kesto::errorText(status));
@@ -82,7 +82,7 @@ void ServiceConnection::stateChanged(const kesto::StateChange& change)
 
 void ServiceConnection::handleState()
 {
-    // A loss and the connection that followed may have been signalled as one.
+    // One signal may stand for a loss and the next connection.
     if (const auto connections = connections_.load(); std::exchange(handledConnections_, connections) != connections) {
         diagnostics_.say("connected to the reporting service");
         saidThatItIsAway_ = false;
@@ -97,7 +97,7 @@ void ServiceConnection::handleState()
     handlers_.lost();
 }
 
-// A call is refused when the service is too far behind, or has just gone.
+// libkesto refuses a call if the service is too slow, or has just gone.
 template <typename Describe> void ServiceConnection::note(ReporterID session, kesto::Status status, Describe describe)
 {
     if (diagnostics_.isVerbose())

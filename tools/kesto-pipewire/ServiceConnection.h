@@ -1,7 +1,7 @@
-// The reporting service behind a connection: the reporter's calls, handed to libkesto.
+// The reporting service behind a connection: passes the reporter's calls to libkesto.
 //
-// libkesto connects again by itself but does not know what a session is made of. This tells, on the loop's
-// thread, when a new connection stands, so that the reporter can make its sessions anew.
+// libkesto connects again by itself but does not create sessions again. This class reports a new connection on the
+// loop's thread, so that the reporter can make its sessions anew.
 #pragma once
 
 #include "kesto-pipewire/Diagnostics.h"
@@ -17,21 +17,21 @@
 
 namespace kesto_pipewire {
 
-// All of it on the loop's thread. The loop and the diagnostics outlive it.
+// All functions run on the loop's thread. The loop and the diagnostics must outlive it.
 class ServiceConnection : public ReportingService {
 public:
     struct Handlers {
-        std::function<void()> appeared; // a new connection, whose service knows nothing
+        std::function<void()> appeared; // a new connection, whose service has no sessions
         std::function<void()> lost;
     };
 
-    // An empty path means where the service is by default.
+    // An empty path means the service's default.
     ServiceConnection(Loop& loop, std::string socketPath, const Diagnostics& diagnostics);
     ~ServiceConnection() override;
 
-    // Begins to connect. Throws std::system_error when the system grants nothing to do it with.
+    // Starts connecting. Throws std::system_error if the system refuses a resource.
     void open(Handlers handlers);
-    // Delivers what was given so far, waiting for a moment at most, and ends. Answers whether all of it arrived.
+    // Delivers the pending calls, waiting only a moment, and closes. Returns whether all of them arrived.
     [[nodiscard]] bool close();
 
     void create(ReporterID session) override;
@@ -53,14 +53,14 @@ private:
     const Diagnostics& diagnostics_;
     Handlers handlers_;
     Source stateSignal_;
-    std::atomic<std::uint64_t> connections_ = 0; // that were made
+    std::atomic<std::uint64_t> connections_ = 0; // the number of connections so far
     std::atomic<bool> isConnected_ = false;
     std::uint64_t handledConnections_ = 0;
     bool saidThatItIsAway_ = false;
     std::uint64_t refusedCalls_ = 0;
-    kesto::Message message_; // used again for every call, so that none allocates
-    kesto::Tracer tracer_; // emits nothing while nobody traces
-    kesto::Client client_; // last: its thread ends before what its callback uses
+    kesto::Message message_; // used for every call, so that calls do not allocate
+    kesto::Tracer tracer_; // emits nothing while no trace runs
+    kesto::Client client_; // declared last: its thread must end before the members that its callback uses
 };
 
 } // namespace kesto_pipewire

@@ -1,7 +1,7 @@
-// What there is to know of a stream, as plain data, and the way changes of it are told.
+// A stream as plain data, and the interface that reports changes of streams.
 //
-// A stream is one player's or recorder's connection to PipeWire. This vocabulary stands between the side
-// that speaks PipeWire and the side that speaks to the reporting service: neither includes the other.
+// A stream is one player's or recorder's connection to PipeWire. These types separate the code for PipeWire from the
+// code for the reporting service: neither includes the other.
 #pragma once
 
 #include "kesto-pipewire/Moment.h"
@@ -16,11 +16,11 @@ using StreamSerial = std::uint64_t;
 
 enum class Direction : std::uint8_t { Output, Input };
 
-// What never changes in a stream's life.
+// The properties that never change in a stream's life.
 struct StreamDescription {
     Direction direction = Direction::Output;
     std::string role{}; // PipeWire's `media.role`, such as "Music"; may be empty
-    std::string application{}; // who plays or records; may be empty
+    std::string application{}; // the player or recorder; may be empty
 };
 
 struct StreamFormat {
@@ -29,8 +29,8 @@ struct StreamFormat {
     friend bool operator==(const StreamFormat&, const StreamFormat&) = default;
 };
 
-// Hears of streams, in the order of what happened: `appeared`, any number of others, `gone`. What is told may
-// repeat what is known already.
+// Gets the events of streams, in their order: `appeared`, any number of others, `gone`. An event may repeat a known
+// state.
 class StreamListener {
 public:
     virtual ~StreamListener() = default;
@@ -40,9 +40,9 @@ public:
     // From 0 to 1 on the scale of the user's slider; 0 when muted.
     virtual void volumeChanged(StreamSerial stream, double volume, Moment when) = 0;
     virtual void formatChanged(StreamSerial stream, const StreamFormat& format, Moment when) = 0;
-    // The names of the devices it is linked with, sorted and joined with ","; empty when there is none.
+    // The names of the linked devices, sorted and joined with ","; empty without a device.
     virtual void devicesChanged(StreamSerial stream, const std::string& devices, Moment when) = 0;
-    // The stream was not ready in time in the cycle that began then, and was not just setting off.
+    // The stream was not ready in time in the cycle that began then, and had not just started.
     virtual void cycleWasLate(StreamSerial stream, Moment when) = 0;
     virtual void gone(StreamSerial stream, Moment when) = 0;
 };

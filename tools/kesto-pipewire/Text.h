@@ -1,5 +1,5 @@
-// Foreign text made fit to be sent: names come from whatever program runs, and the reporting service ends a
-// connection over text that is not UTF-8.
+// Makes foreign text valid for sending: any program chooses its names, and the reporting service ends a connection that
+// sends text that is not UTF-8.
 #pragma once
 
 #include <cstddef>

@@ -1,9 +1,8 @@
-// kesto-pipewire: reports every stream of a running PipeWire to the reporting service, so that nothing needs
-// to be changed in any player.
+// kesto-pipewire: reports every stream of a running PipeWire to the reporting service, so that players stay unchanged.
 //
-// Here the parts meet: the observer, which speaks PipeWire; the reporter, which decides what is told; the connection to
+// This file connects the parts: the observer of PipeWire; the reporter, which decides what to report; the connection to
 // the service; and the channels, which the service reads by itself. The program runs until a signal ends it and then
-// ends every session; it outlives both servers and waits for whichever is away.
+// ends every session. If one of the two servers goes, it waits until the server is back.
 
 #include "kesto-pipewire/DeviceChannels.h"
 #include "kesto-pipewire/Diagnostics.h"
@@ -36,13 +35,13 @@ struct Options {
     bool verbose = false;
 };
 
-// Brings PipeWire's library up and down again around everything that uses it.
+// Sets up PipeWire's library before its users, and tears it down after them.
 class Library {
 public:
     Library()
     {
         pw_init(nullptr, nullptr);
-        // What it would say by itself we say in our own words, unless somebody asks for it.
+        // The program has its own messages, so the library's log is off unless the variable switches it on.
         if (!std::getenv("PIPEWIRE_DEBUG"))
             pw_log_set_level(SPA_LOG_LEVEL_NONE);
     }
@@ -51,8 +50,8 @@ public:
     Library& operator=(const Library&) = delete;
 };
 
-// Other programs choose reporter IDs too, perhaps from 1 upwards. The process ID keeps ours apart, and 2^53,
-// beyond which readers of JSON lose digits, out of reach.
+// Other programs choose reporter IDs too, perhaps from 1 upwards. The process ID makes this program's IDs different,
+// and keeps them below 2^53, beyond which readers of JSON lose digits.
 ReporterID firstReporterID()
 {
     return (ReporterID{getpid()} << 24) + 1;
@@ -67,7 +66,7 @@ int run(const Options& options)
     const auto terminate = loop.addSignal(SIGTERM, end);
     const auto interrupt = loop.addSignal(SIGINT, end);
 
-    // Before the service is reached: where it is started by that, it finds the channels.
+    // Before the connection, so that a service that the connection starts finds the channels.
     DeviceChannels channels(options.channels, diagnostics);
     ServiceConnection service(loop, options.socket, diagnostics);
     Source alarm;
@@ -101,7 +100,7 @@ int main(int argumentCount, char** arguments)
     app.add_option("--remote", options.remote, "Name or socket of the PipeWire server")->type_name("NAME");
     app.add_option("--channels", options.channels, "Root of the channel tree, for the statistics of devices")
         ->type_name("PATH");
-    app.add_flag("--verbose", options.verbose, "Say everything that is reported");
+    app.add_flag("--verbose", options.verbose, "Print every report");
     app.set_version_flag("--version", std::string("kesto-pipewire ") + kesto_version());
     try {
         app.parse(argumentCount, arguments);

@@ -1,18 +1,18 @@
-// The subcommands of `kesto`, a file each. One that is chosen runs after the command line was read and sets the
-// exit status.
+// The subcommands of `kesto`, a file each. The chosen one runs after the command line was parsed and sets the exit
+// status.
 #pragma once
 
 #include <CLI/App.hpp>
 #include <CLI/Config.hpp>
 #include <CLI/Formatter.hpp>
 
-// Exit statuses; a wrong command line is 2, and 3 that something is missing in what is shown.
+// Exit statuses; 2 is a wrong command line, 3 means incomplete results.
 constexpr int exitOk = 0;
 constexpr int exitFailure = 1;
 constexpr int exitUsage = 2;
 constexpr int exitIncomplete = 3;
 
-// That one of the subcommands must be chosen. A word that names none is then told, and not that there is none.
+// Requires a subcommand. For an unknown word the error names the word, instead of a missing subcommand.
 void requireSubcommand(CLI::App& application);
 
 void addBugsCommand(CLI::App& application, int& exitStatus);

@@ -1,4 +1,4 @@
-// The vocabulary has functions from number to name only: here every number that has a name of its own is tried.
+// The vocabulary only maps numbers to names, so these functions try every number that has a name.
 #include "kesto/Names.h"
 
 #include <algorithm>

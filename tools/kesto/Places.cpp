@@ -30,7 +30,7 @@ fs::path usualDatabase()
 {
     const fs::path name = "analytics.sqlite3";
     const fs::path home = environment("HOME");
-    // The last is where the service manager of a user kept state before version 254.
+    // The last is the place of a user's service manager before version 254.
     return usualDirectory("STATE_DIRECTORY",
                           {fs::path(environment("XDG_STATE_HOME")) / "kesto", home / ".local/state/kesto",
                            fs::path(environment("XDG_CONFIG_HOME")) / "kesto", home / ".config/kesto"},

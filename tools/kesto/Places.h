@@ -1,5 +1,5 @@
-// Where the service keeps its things, if nobody says otherwise: where the environment says, in systemd's names, as for
-// the service itself; else in the user's own directories, if the user has a service; else in the system's.
+// The default directories of the service: those of the environment, in systemd's names, as for the service itself; else
+// the user's own directories, if the user has a service; else the system's.
 #pragma once
 
 #include <filesystem>

@@ -1,4 +1,4 @@
-// Characters are told apart by the first bytes of their UTF-8, whether or not the rest is in order.
+// Characters are counted by their first bytes in UTF-8, even if the other bytes are wrong.
 #include "kesto/Terminal.h"
 
 #include "foundation/values/Json.h"
@@ -61,7 +61,7 @@ std::size_t outputWidth()
         return size.ws_col;
     if (const char* columns = std::getenv("COLUMNS"))
         return std::max<std::size_t>(narrowest, std::strtoul(columns, nullptr, 10));
-    return std::string::npos; // not a terminal: nothing is cut
+    return std::string::npos; // not a terminal: lines are not cut
 }
 
 std::size_t columnsBehind(std::size_t used, std::size_t width)

@@ -1,5 +1,5 @@
-// Text for a person at a terminal: what could disturb the terminal is taken out, and lines are cut to its width. Every
-// character counts as one column.
+// Text for a person at a terminal: control characters are replaced, and lines are cut to its width. Every character
+// counts as one column.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -9,14 +9,14 @@
 
 // The text with "?" for every control character: those of ASCII, and U+0080 to U+009F.
 [[nodiscard]] std::string printable(std::string_view text);
-// So many columns of the text at most; what is cut ends in "…".
+// At most so many columns of the text; a cut text ends in "…".
 [[nodiscard]] std::string fitted(std::string_view text, std::size_t columns);
-// So many columns at least, with blanks behind the text.
+// At least so many columns, with blanks behind the text.
 [[nodiscard]] std::string padded(std::string text, std::size_t columns);
 
-// How many columns standard output has: those of the terminal, else $COLUMNS, else without end (npos).
+// How many columns standard output has: those of the terminal, else $COLUMNS, else unlimited (npos).
 [[nodiscard]] std::size_t outputWidth();
-// What is left of the width behind so many columns, and something at least.
+// The rest of the width behind so many columns, but not too little.
 [[nodiscard]] std::size_t columnsBehind(std::size_t used, std::size_t width);
 
 // A string as it is, a date in ISO 8601, anything else as JSON.

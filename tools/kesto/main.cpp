@@ -1,4 +1,4 @@
-// kesto: how a person talks to the service and reads what it found out.
+// kesto: lets a person call the service and read its results.
 #include "kesto/Commands.h"
 
 #include <CLI/Error.hpp>
@@ -17,7 +17,7 @@ void requireSubcommand(CLI::App& application)
 
 int main(int argumentCount, char** arguments)
 {
-    CLI::App application("Talks to the audio reporting service and shows what it found out.", "kesto");
+    CLI::App application("Calls the audio reporting service and shows its results.", "kesto");
     application.set_version_flag("--version", "kesto " KESTO_VERSION);
     requireSubcommand(application);
     int exitStatus = exitOk;

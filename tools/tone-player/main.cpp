@@ -1,10 +1,10 @@
-// tone-player: a player for tests and demonstrations, because no common one can be paused from a script.
+// tone-player: a player for tests and demonstrations, because common players cannot be paused from a script.
 //
 //   tone-player [ROLE [NAME]]
 //
-// Plays a quiet tone through PipeWire until its standard input ends, and obeys the lines it reads there:
-// "pause" and "play". ROLE is the stream's `media.role`, "Music" if it is not given, NAME its application's
-// name. It is an ordinary stream in every respect: nothing in it knows of reporting.
+// Plays a quiet tone through PipeWire until its standard input ends, and obeys the lines it reads there: "pause" and
+// "play". ROLE is the stream's `media.role`, "Music" if it is not given, NAME its application's name. It is an ordinary
+// stream, and does not depend on reporting.
 
 #include "kesto-pipewire/Loop.h"
 
@@ -94,7 +94,7 @@ int play(const char* role, const char* name)
                                                            PW_KEY_NODE_NAME, name, nullptr),
                                          &events, &player);
     if (!player.stream || !connect(player.stream)) {
-        std::fputs("tone-player: there is no PipeWire\n", stderr);
+        std::fputs("tone-player: PipeWire is not running\n", stderr);
         return 1;
     }
 
@@ -120,8 +120,8 @@ int play(const char* role, const char* name)
 } // namespace
 
 #ifdef __SANITIZE_ADDRESS__
-// Looking for leaks at the program's end now and then waits for ever for a thread of PipeWire's library that is just
-// ending.
+// Switches off the leak check at the program's end, because it sometimes waits for ever for an ending thread of
+// PipeWire's library.
 extern "C" int __lsan_is_turned_off() // NOLINT(bugprone-reserved-identifier): the sanitizer's name
 {
     return 1;

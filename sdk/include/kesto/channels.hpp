@@ -7,8 +7,8 @@
 //         return;
 //     late.add(1);
 //
-// A thin layer over channels.h, all of it inline; what that says about threads, real time, forks and names holds
-// here word by word. C++17 or later; no exceptions and no run-time types are needed.
+// A thin layer over channels.h, all of it inline; the rules there about threads, real time, forks and names hold here,
+// too. C++17 or later; no exceptions and no run-time types are needed.
 #ifndef KESTO_CHANNELS_HPP
 #define KESTO_CHANNELS_HPP
 
@@ -24,17 +24,17 @@
 
 namespace kesto {
 
-// How a publisher is to be; channels.h says more about each.
+// Options of a publisher; channels.h describes each.
 struct PublisherOptions {
-    std::string root; // empty: where the service looks by default
+    std::string root; // empty: the service's default
     std::chrono::milliseconds writeInterval{0}; // 0: 500 ms
     std::chrono::milliseconds refreshInterval{0}; // 0: 1 s; max(): never
 };
 
 using PublisherStatistics = kesto_publisher_statistics;
 
-// Owns the thread that writes the files of its channels. Opening, moving and destroying are done while nobody else
-// uses it. Channels are declared after their publisher, so that they go first.
+// Owns the thread that writes the files of its channels. No other thread may use it while it is opened, moved or
+// destroyed. Declare channels after their publisher, so that they are destroyed first.
 class Publisher {
 public:
     Publisher() noexcept = default;
@@ -46,8 +46,8 @@ public:
     }
     ~Publisher() { kesto_publisher_free(publisher_); }
 
-    // One that was open before is freed, which its channels must not outlive. InvalidArgument, OutOfMemory or
-    // SystemError when it cannot be.
+    // Frees the publisher that was open before, whose channels must be destroyed already. InvalidArgument, OutOfMemory
+    // or SystemError on failure.
     [[nodiscard]] Status open(const PublisherOptions& options = PublisherOptions()) noexcept
     {
         kesto_publisher_options given{};
@@ -60,10 +60,10 @@ public:
     }
     [[nodiscard]] bool isOpen() const noexcept { return publisher_ != nullptr; }
 
-    // Writes what has changed, and how long states have lasted, before it returns.
+    // Writes changed channels, and the times of states, before it returns.
     Status flush() noexcept { return Status(kesto_publisher_flush(publisher_)); }
 
-    // Where the channel tree is; empty while it is not open.
+    // The path of the channel tree; empty while the publisher is not open.
     [[nodiscard]] std::string root() const
     {
         const char* const root = kesto_publisher_root(publisher_);
@@ -89,7 +89,7 @@ private:
     kesto_publisher* publisher_ = nullptr;
 };
 
-// What a channel is called. Without a group or a subgroup where that is empty.
+// The name of a channel. An empty group or subgroup means none.
 struct ChannelName {
     std::string driver;
     std::string group;
@@ -97,7 +97,7 @@ struct ChannelName {
     std::string channel;
 };
 
-// What all channels have in common: whose file goes with it. One that was not created takes no change:
+// The common part of all channels; its destructor removes the file. A channel that was not created returns
 // InvalidArgument.
 class Channel {
 public:
@@ -157,7 +157,7 @@ public:
     Status record(std::int64_t value) noexcept { return Status(kesto_channel_record(get(), value)); }
 };
 
-// In which state something is, and for how long.
+// The state of something, and the time in each state.
 class StateChannel : public Channel {
 public:
     [[nodiscard]] Status create(const Publisher& publisher, const ChannelName& name,

@@ -1,4 +1,4 @@
-// libkesto for C++: reports what a program does with audio to the Kesto reporting service (kestod).
+// libkesto for C++: reports a program's use of audio to the Kesto reporting service (kestod).
 //
 //     kesto::Client client;
 //     if (client.open() != kesto::Status::Ok)
@@ -12,9 +12,9 @@
 //     client.send(message, kesto::Category::Playback, kesto::EventType::Start, 42);
 //
 // This is a thin layer over kesto.h, all of it inline: the library's interface is C, so that one
-// binary serves every compiler and every standard library. What kesto.h says about threads, real time, forks and lost
-// connections holds here word by word. C++17 or later; no exceptions and no run-time types are needed. A callback
-// that throws ends the program.
+// binary serves every compiler and every standard library. The rules in kesto.h about threads, real time, forks and
+// lost connections hold here, too. C++17 or later; no exceptions and no run-time types are needed. A callback that
+// throws ends the program.
 #ifndef KESTO_KESTO_HPP
 #define KESTO_KESTO_HPP
 
@@ -58,13 +58,13 @@ enum class Status : int {
     SessionEnded = KESTO_SESSION_ENDED
 };
 
-// The status in words, such as "the queue is full".
+// The text of the status, such as "the queue is full".
 inline const char* errorText(Status status) noexcept
 {
     return kesto_error_text(static_cast<kesto_status>(status));
 }
 
-// Identifies a session; unique in the whole system, so better random than 1. 0 stands for no session.
+// Identifies a session; it should be unique in the whole system, so choose a random number. 0 stands for no session.
 using ReporterID = kesto_reporter;
 
 enum class ServiceType : std::uint16_t {
@@ -157,7 +157,7 @@ enum class Operation : int {
 enum class State : int {
     Connecting = KESTO_STATE_CONNECTING, // calls are taken and wait for the connection
     Connected = KESTO_STATE_CONNECTED,
-    Disconnected = KESTO_STATE_DISCONNECTED, // calls are refused, until the next attempt if there is to be one
+    Disconnected = KESTO_STATE_DISCONNECTED, // calls are refused until the next attempt, if any
     Closed = KESTO_STATE_CLOSED // for good
 };
 
@@ -174,9 +174,9 @@ struct IsRange<T, std::void_t<decltype(std::declval<const T&>().begin()), declty
 
 // A dictionary of keys and values, encoded while it is built; a message or a configuration. One thread at a time.
 //
-// A failure (text that is not UTF-8, too large, too deep, a forgotten `end`, no memory) stays until `clear`:
-// `status` tells it, and sending the message returns it. Cleared instead of made anew, a message allocates nothing
-// once it has seen its largest content. A message that was moved from can only be assigned to or destroyed.
+// A failure (text that is not UTF-8, too large, too deep, a forgotten `end`, no memory) stays until `clear`: `status`
+// and sending the message return it. A message that is cleared instead of made anew does not allocate after it has held
+// its largest content once. A message that was moved from can only be assigned to or destroyed.
 class Message {
 public:
     Message() noexcept : message_(kesto_message_create()) { }
@@ -194,7 +194,7 @@ public:
         return append(values);
     }
 
-    // Adds an element to the array that was begun last.
+    // Adds an element to the innermost open array.
     template <typename T> Message& append(const T& value)
     {
         if constexpr (std::is_same_v<T, std::nullptr_t>)
@@ -218,8 +218,8 @@ public:
         return *this;
     }
 
-    // What is added next stands in the array or in the dictionary, until the matching `end`. Without a key: as an
-    // element of the array that was begun last.
+    // The next additions go into the array or dictionary, until the matching `end`. Without a key it becomes an element
+    // of the innermost open array.
     Message& beginArray(std::string_view key) noexcept
     {
         kesto_message_key(get(), key.data(), key.size());
@@ -284,13 +284,13 @@ private:
 
 // ---- Answers ----
 
-// A list of reporters that stands somewhere else: for arguments and answers, not for keeping.
+// A view of a list of reporters, for arguments and answers: it does not own the list.
 class Reporters {
 public:
     using value_type = ReporterID;
     using const_iterator = const ReporterID*;
 
-    Reporters() noexcept : Reporters(nullptr, 0) { } // an empty list: nobody
+    Reporters() noexcept : Reporters(nullptr, 0) { } // an empty list
     Reporters(const ReporterID& one) noexcept : reporters_(&one), count_(1) { }
     Reporters(std::initializer_list<ReporterID> reporters) noexcept : Reporters(reporters.begin(), reporters.size()) { }
     Reporters(const std::vector<ReporterID>& reporters) noexcept : Reporters(reporters.data(), reporters.size()) { }
@@ -300,7 +300,7 @@ public:
     {
     }
 
-    // Stands for all started sessions of all clients, where a message is sent.
+    // As the receivers of a message: all started sessions of all clients.
     static Reporters allStarted() noexcept
     {
         Reporters all;
@@ -326,29 +326,29 @@ public:
 
     [[nodiscard]] std::uint64_t call() const noexcept { return answer_.call; } // its number on the connection
     [[nodiscard]] Operation operation() const noexcept { return Operation(answer_.operation); }
-    // That the call was for; 0 for those that name none, and for `send`.
+    // The call's reporter; 0 for calls without one, and for `send`.
     [[nodiscard]] ReporterID reporter() const noexcept { return answer_.reporter; }
 
-    // Whether all is well; only then the results below are valid.
+    // Whether the call succeeded; only then the results below are valid.
     [[nodiscard]] bool ok() const noexcept { return answer_.error_domain == nullptr; }
-    // Empty when all is well.
+    // Empty on success.
     [[nodiscard]] std::string_view errorDomain() const noexcept
     {
         return ok() ? std::string_view() : std::string_view(answer_.error_domain);
     }
     [[nodiscard]] std::int64_t errorCode() const noexcept { return answer_.error_code; }
-    // What the library itself reports (ConnectionLost, Closed, SessionEnded); Ok for answers of the service.
+    // The library's own error (ConnectionLost, Closed, SessionEnded); Ok for answers of the service.
     [[nodiscard]] Status status() const noexcept
     {
         return errorDomain() == KESTO_ERROR_DOMAIN ? Status(answer_.error_code) : Status::Ok;
     }
 
     [[nodiscard]] bool success() const noexcept { return answer_.success; }
-    // Of getServiceType and validate. Unknown: no such session.
+    // For getServiceType and validate. Unknown: the session does not exist.
     [[nodiscard]] ServiceType serviceType() const noexcept { return ServiceType(answer_.service_type); }
-    // Of validate. 0: no such session.
+    // For validate. 0: the session does not exist.
     [[nodiscard]] ReporterID validReporter() const noexcept { return answer_.valid_reporter; }
-    // Of getAllReporters.
+    // For getAllReporters.
     [[nodiscard]] Reporters reporters() const noexcept { return {answer_.reporters, answer_.reporter_count}; }
 
 private:
@@ -364,18 +364,18 @@ using AnswerCallback = std::function<void(const Answer& answer)>;
 struct StateChange {
     State state;
     Status reason; // why it is disconnected: ConnectFailed, ConnectionLost or ProtocolViolation; else Ok
-    int systemError; // `errno` of that reason where the system gave one, else 0
-    bool willRetry; // whether there will be another attempt
-    std::chrono::milliseconds retryAfter; // until it
-    std::string_view socketPath; // of the connection, or the last one that was tried
+    int systemError; // `errno` of that reason if the system gave one, else 0
+    bool willRetry; // whether another attempt will follow
+    std::chrono::milliseconds retryAfter; // the time until that attempt
+    std::string_view socketPath; // of the connection, or of the last attempt
 };
 
 // Called on the client's thread for every change of state after the first Connecting.
 using StateCallback = std::function<void(const StateChange& change)>;
 
-// How a client is to be; kesto.h says more about each.
+// Options of a client; kesto.h describes each.
 struct Options {
-    std::string socketPath; // empty: where the service is by default
+    std::string socketPath; // empty: the service's default
     std::string serviceName; // empty: "com.quarn.kesto.reporting"
     std::size_t queueBytes = 0; // 0: 256 KiB
     std::uint32_t unansweredLimit = 0; // 0: 4096
@@ -387,8 +387,8 @@ struct Options {
     bool trace = false; // true: events can be emitted into the kernel's trace; see trace.hpp
 };
 
-// One connection to the service. Any thread; but opening, moving and destroying are done while nobody else
-// uses it. A client that is not open answers every call with Closed.
+// One connection to the service. Any thread; but no other thread may use it while it is opened, moved or destroyed. A
+// client that is not open answers every call with Closed.
 //
 // `callback` may be empty. With one, a call allocates; `send` without one never does.
 class Client {
@@ -402,8 +402,8 @@ public:
     }
     ~Client() { kesto_client_free(client_); }
 
-    // Begins to connect, without waiting; calls may be made right away. A client that was open before is closed.
-    // InvalidArgument, OutOfMemory or SystemError when it cannot be.
+    // Starts connecting, without waiting; calls are possible at once. A client that was open before is closed.
+    // InvalidArgument, OutOfMemory or SystemError on failure.
     [[nodiscard]] Status open(const Options& options = Options())
     {
         kesto_options given{};
@@ -428,14 +428,14 @@ public:
 
     [[nodiscard]] bool isOpen() const noexcept { return client_ != nullptr; }
 
-    // Sends what was given so far and waits for its answers, as long as `timeout`, then ends the connection. All
-    // callbacks have been called when it returns. The destructor closes without waiting for answers.
+    // Sends the taken calls and waits for their answers, for at most `timeout`, then ends the connection. All callbacks
+    // have been called when it returns. The destructor closes without waiting for answers.
     Status close(std::chrono::milliseconds timeout = std::chrono::seconds(1)) noexcept
     {
         return Status(kesto_client_close(get(), milliseconds(timeout)));
     }
 
-    // Waits until what this thread gave before has been sent and answered, as long as `timeout`.
+    // Waits until all earlier calls of this thread are sent and answered, for at most `timeout`.
     Status flush(std::chrono::milliseconds timeout) noexcept
     {
         return Status(kesto_client_flush(get(), milliseconds(timeout)));
@@ -449,7 +449,7 @@ public:
         return statistics;
     }
 
-    // The operations, in the order of the wire. Ok when the call was taken, and else why not; the callback then is
+    // The operations, in the order of the wire. Ok if the call was taken; else the reason, and the callback is
     // destroyed without a call.
 
     Status createSession(ReporterID reporter, AnswerCallback callback = nullptr)
@@ -508,7 +508,7 @@ public:
     {
         return call(std::move(callback), kesto_client_get_all_reporters);
     }
-    // Ends the service. Never answered but by ConnectionLost.
+    // Ends the service. The only answer is ConnectionLost.
     Status killService(AnswerCallback callback = nullptr)
     {
         return call(std::move(callback), kesto_client_kill_service);
@@ -537,7 +537,7 @@ private:
     }
     template <typename Callback> static void release(void* user) noexcept { delete static_cast<Callback*>(user); }
 
-    // Calls the function of kesto.h with the callback behind its arguments; the library releases it.
+    // Calls the function of kesto.h with the callback behind its arguments; the library releases the callback.
     template <typename Function, typename... Arguments>
     Status call(AnswerCallback callback, Function function, Arguments... arguments)
     {

@@ -12,7 +12,7 @@
 //         mix(buffer);
 //     }
 //
-// A thin layer over trace.h, all of it inline; what that says about cost, threads and rights holds here word by word.
+// A thin layer over trace.h, all of it inline; the rules there about cost, threads and rights hold here, too.
 #ifndef KESTO_TRACE_HPP
 #define KESTO_TRACE_HPP
 
@@ -23,13 +23,12 @@
 
 namespace kesto {
 
-// What events are emitted through. Copies are as good as the original; none is used after its client is gone. Any
-// thread.
+// A program emits events through it. Copies are equivalent; do not use one after its client is destroyed. Any thread.
 class Tracer {
 public:
-    // One that emits nothing.
+    // A tracer that emits nothing.
     Tracer() noexcept : tracer_(kesto_client_tracer(nullptr)) { }
-    // Of an open client whose options asked for it; otherwise it emits nothing.
+    // The tracer of an open client with the option `trace`; for any other client it emits nothing.
     explicit Tracer(const Client& client) noexcept : tracer_(kesto_client_tracer(client.get())) { }
 
     [[nodiscard]] bool isActive() const noexcept { return kesto_trace_active(tracer_); }
@@ -44,7 +43,7 @@ private:
     const kesto_tracer* tracer_;
 };
 
-// Emits one event when it is made and another when it goes.
+// Emits one event when it is made and another when it is destroyed.
 class TraceInterval {
 public:
     TraceInterval(const Tracer& tracer, std::uint32_t beginCode, std::uint32_t endCode) noexcept

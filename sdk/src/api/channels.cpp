@@ -1,5 +1,4 @@
-// The interface of channels.h on the classes behind it: what callers give is checked here, and nothing throws out of
-// it.
+// Implements channels.h with the classes of the library: checks callers' arguments, and lets no exception out.
 #include "kesto/channels.h"
 
 #include "channels/Publisher.h"
@@ -19,7 +18,7 @@ namespace {
 constexpr std::uint32_t defaultWriteInterval = 500;
 constexpr std::uint32_t defaultRefreshInterval = 1000;
 
-// What a caller that was built with another version of the header gave, as this version has it.
+// The options of a caller, which may have been built with another version of the header, in this version's form.
 kesto_publisher_options completed(const kesto_publisher_options* given) noexcept
 {
     kesto_publisher_options options{};
@@ -43,7 +42,7 @@ libkesto::PublisherSettings settings(const kesto_publisher_options& options)
     return settings;
 }
 
-// Publishes what `make` makes, or tells why not.
+// Publishes the channel that `make` makes, or returns the error.
 template <typename Make>
 kesto_status create(kesto_publisher* publisher, const kesto_channel_name* name, kesto_channel** channel,
                     Make make) noexcept

@@ -1,5 +1,4 @@
-// The interface of kesto.h on the classes behind it: null pointers are looked after here, and nothing throws out of
-// it.
+// Implements kesto.h with the classes of the library: checks for null pointers, and lets no exception out.
 #include "kesto/kesto.h"
 
 #include "calls/Client.h"
@@ -23,7 +22,7 @@ namespace {
 
 // ---- Messages ----
 
-// Adds the key, if there is one, and then what `addValue` adds.
+// Adds the key, if it is given, and then the value by `addValue`.
 template <typename AddValue> kesto_status addEntry(kesto_message* message, const char* key, AddValue addValue) noexcept
 {
     if (message == nullptr)
@@ -58,7 +57,7 @@ std::string textOrEmpty(const char* text)
     return text == nullptr ? std::string() : std::string(text);
 }
 
-// What a caller that was built with another version of the header gave, as this version has it.
+// The options of a caller, which may have been built with another version of the header, in this version's form.
 kesto_options completed(const kesto_options* given) noexcept
 {
     kesto_options options{};
@@ -113,10 +112,10 @@ const char* kesto_error_text(kesto_status status)
     switch (status) {
     case KESTO_OK: return "all is well";
     case KESTO_INVALID_ARGUMENT: return "an argument is invalid";
-    case KESTO_OUT_OF_MEMORY: return "there is no memory left";
+    case KESTO_OUT_OF_MEMORY: return "memory is exhausted";
     case KESTO_SYSTEM_ERROR: return "the system refused a descriptor, a thread or a file";
     case KESTO_QUEUE_FULL: return "the queue is full";
-    case KESTO_NOT_CONNECTED: return "there is no connection to the service";
+    case KESTO_NOT_CONNECTED: return "the client is not connected to the service";
     case KESTO_CLOSED: return "the client is closed";
     case KESTO_TIMED_OUT: return "the time is over";
     case KESTO_WRONG_THREAD: return "a callback of a client cannot wait for that client";
@@ -254,7 +253,7 @@ try {
     auto made = kesto_client::create(settings(options, *std::move(paths), std::move(listener), std::move(tracer)));
     if (made == nullptr)
         return KESTO_SYSTEM_ERROR;
-    *client = made.get(); // before the first callback, which may want to use it
+    *client = made.get(); // before the first callback, which may use it
     if (!made->start()) {
         *client = nullptr;
         return KESTO_SYSTEM_ERROR;

@@ -1,4 +1,4 @@
-// The interface of trace.h on the classes behind it.
+// Implements trace.h with the classes of the library.
 #include "kesto/trace.h"
 
 #include "Tracer.h"

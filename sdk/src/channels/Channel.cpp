@@ -1,4 +1,4 @@
-// Changing a channel is lock-free and its text is not: that is made by one thread at a time, from whatever it sees.
+// Changing a channel is lock-free. Making its text is not: one thread at a time makes it, from the values that it sees.
 #include "channels/Channel.h"
 
 #include "foundation/text/Format.h"
@@ -62,7 +62,7 @@ void HistogramChannel::appendText(std::string& text, Time)
 {
     const auto out = std::back_inserter(text);
     foundation::format_to(out, "histogram{}{}\n", unit_.empty() ? "" : " ", unit_);
-    const bool isEmpty = minimum_.load() > maximum_.load(); // or its first value is just being recorded
+    const bool isEmpty = minimum_.load() > maximum_.load(); // or a thread is just recording the first value
     foundation::format_to(out, "{} {}\n", isEmpty ? 0 : minimum_.load(), isEmpty ? 0 : maximum_.load());
     for (std::size_t bucket = 0; bucket < hits_.size(); ++bucket)
         foundation::format_to(out, "{} {} {}\n", bounds_[bucket], bounds_[bucket + 1], hits_[bucket].load());
@@ -95,7 +95,7 @@ kesto_status StateChannel::enter(std::size_t state, Time now) noexcept
     do {
         if (before.state == state)
             return KESTO_OK;
-        // Threads that meet may have looked at the clock in another order than they come here.
+        // Concurrent threads may have read the clock in another order than they come here.
         next = {state, std::max<std::uint64_t>(before.since, moment)};
     } while (!present_.compare_exchange_weak(before, next));
     states_[before.state].microseconds.fetch_add(next.since - before.since);
@@ -104,8 +104,8 @@ kesto_status StateChannel::enter(std::size_t state, Time now) noexcept
     return KESTO_OK;
 }
 
-// The state that lasts is credited with its time when it is left. Who reads in between must not count that time twice,
-// and so looks whether the same state lasted all the while; a time that is not credited yet is only late.
+// The present state gets its time when it is left. A reader must not count that time twice, so it checks that the state
+// did not change while it read; a time that is not added yet merely comes later.
 std::optional<StateChannel::Present> StateChannel::readTimes()
 {
     constexpr int mostAttempts = 100;

@@ -1,7 +1,7 @@
-// The value of a channel, which any thread changes at any time, and the text that its file shows of it.
+// The value of a channel, which any thread may change at any time, and the text of its file.
 //
-// Values are atomic and stand by themselves: nobody waits for anybody. What is read while it changes may be a moment
-// old, but no count in it ever goes back, since that would say that the channel has begun anew.
+// Values are atomic and independent: threads never wait for each other. A reader may see a value that is a moment old,
+// but a count never goes back, because that would mean that the channel has begun anew.
 #pragma once
 
 #include "Doorbell.h"
@@ -23,8 +23,8 @@ using ChannelClock = std::chrono::steady_clock;
 
 } // namespace libkesto
 
-// The opaque type of the interface. Changes: any thread. What is not said otherwise: whoever holds the publisher's
-// lock.
+// The opaque type of the interface. Any thread may change it; all other functions need the publisher's lock, unless
+// they say otherwise.
 struct kesto_channel {
 public:
     using Time = libkesto::ChannelClock::time_point;
@@ -34,27 +34,27 @@ public:
     kesto_channel(const kesto_channel&) = delete;
     kesto_channel& operator=(const kesto_channel&) = delete;
 
-    // Refused by channels of another kind. Any thread.
+    // Channels of other kinds refuse it. Any thread.
     virtual kesto_status add(std::int64_t) noexcept { return KESTO_INVALID_ARGUMENT; }
     virtual kesto_status set(std::int64_t) noexcept { return KESTO_INVALID_ARGUMENT; }
     virtual kesto_status record(std::int64_t) noexcept { return KESTO_INVALID_ARGUMENT; }
     virtual kesto_status enter(std::size_t, Time) noexcept { return KESTO_INVALID_ARGUMENT; }
 
-    // Whether time passes in it while nobody touches it.
+    // Whether its value grows with time.
     [[nodiscard]] virtual bool isTimed() const noexcept { return false; }
     // The content of the file.
     virtual void appendText(std::string& text, Time now) = 0;
 
-    // Whether there is something that has not been written.
+    // Whether it has changes that are not written yet.
     [[nodiscard]] bool isChanged() const noexcept { return isChanged_.load(); }
     void setChanged(bool isChanged) noexcept { isChanged_.store(isChanged); }
 
-    // Who writes it, once it was added there.
+    // Its publisher, after it was added.
     [[nodiscard]] kesto_publisher& publisher() const noexcept { return *publisher_; }
     void setPublisher(kesto_publisher& publisher) noexcept { publisher_ = &publisher; }
 
 protected:
-    // After a value was changed, by an operation that is sequentially consistent. Any thread.
+    // Call it after each change of a value, which must be sequentially consistent. Any thread.
     void changed() noexcept
     {
         if (!isChanged_.load() && !isChanged_.exchange(true))
@@ -111,11 +111,11 @@ private:
     struct State {
         std::string name;
         std::atomic<std::uint64_t> transitions = 0;
-        std::atomic<std::uint64_t> microseconds = 0; // up to when it was last left
-        std::uint64_t read = 0; // microseconds, at the last look
-        std::uint64_t shown = 0; // milliseconds; never become less
+        std::atomic<std::uint64_t> microseconds = 0; // in this state, up to its last end
+        std::uint64_t read = 0; // microseconds, at the last reading
+        std::uint64_t shown = 0; // milliseconds; never decreases
     };
-    // The state and since when, so that both change at once.
+    // The state and its begin, which change together.
     struct Present {
         std::uint64_t state : 8;
         std::uint64_t since : 56; // in microseconds since the channel was made: enough for two thousand years
@@ -123,7 +123,8 @@ private:
     static_assert(KESTO_MOST_STATES <= 256 && std::atomic<Present>::is_always_lock_free);
 
     [[nodiscard]] std::uint64_t microsecondsAt(Time now) const noexcept;
-    // The state that lasts, and what the others have been credited with up to then. Nothing when it never lasts.
+    // Reads the present state and the times of all states up to its begin. Nothing if the state keeps changing
+    // meanwhile.
     std::optional<Present> readTimes();
 
     const Time begin_;

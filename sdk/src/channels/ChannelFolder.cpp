@@ -1,4 +1,4 @@
-// Folders are made and entered one by one, from the root on; a file is written beside its place and renamed into it.
+// Folders are made and opened one by one, from the root on; a file is written beside its place and then renamed.
 #include "channels/ChannelFolder.h"
 
 #include "foundation/values/String.h"
@@ -45,7 +45,7 @@ FileDescriptor openFolder(int parent, const char* name, int linkFlag)
     return FileDescriptor(::openat(parent, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC | linkFlag));
 }
 
-// Others must be able to read what they are to see, whatever this process hides by its umask.
+// Makes the folder readable for other users, despite the umask.
 int makeFolder(int parent, const char* name)
 {
     if (::mkdirat(parent, name, folderPermissions) == 0)
@@ -53,7 +53,7 @@ int makeFolder(int parent, const char* name)
     return errno == EEXIST ? 0 : errno;
 }
 
-// Steps into the folder, if it is there and belongs to this user or the administrator.
+// Opens the folder, if it exists and belongs to this user or the administrator.
 int enter(FileDescriptor& folder, const char* name)
 {
     FileDescriptor next = openFolder(folder.get(), name, O_NOFOLLOW);
@@ -128,7 +128,7 @@ ChannelFolder::ChannelFolder(std::string root, ChannelPlace place, std::string t
 
 ChannelFolder::~ChannelFolder()
 {
-    const int error = errno; // which may be on its way to a caller that gave up
+    const int error = errno; // which a failing caller may be about to return
     claim_.reset();
     removeIfEmpty(root_, place_);
     errno = error;
@@ -175,7 +175,7 @@ int ChannelFolder::write(const std::string& name, std::string_view text) noexcep
 
 int ChannelFolder::replace(const std::string& name, std::string_view text) noexcept
 {
-    // Somebody may have cleared the tree away, and another publisher removes a folder that it leaves empty.
+    // Another program may have removed the tree, and another publisher removes a folder that becomes empty.
     constexpr int mostAttempts = 3;
     int error = ENOENT;
     for (int attempt = 0; error == ENOENT && attempt < mostAttempts; ++attempt) {

@@ -1,8 +1,9 @@
-// The folders of the channel tree, from the publisher's side: made where they are missing, entered step by step and
-// never through a link, and filled with files that are complete when they appear.
+// The publisher's side of the channel tree: it makes missing folders, opens them step by step and never through a link,
+// and puts complete files into them.
 //
-// Others may write where this program does, and it may be one with more rights than theirs. So a folder that belongs
-// neither to its user nor to the system's administrator is not entered: what is in it could be exchanged at any time.
+// Other users may write to the tree, too, and this program may have more rights than they have. So it does not use a
+// folder that belongs neither to its user nor to the system's administrator: the owner could replace its content at any
+// time.
 #pragma once
 
 #include "channels/DriverClaim.h"
@@ -20,24 +21,24 @@ namespace libkesto {
 // Driver, group and subgroup, as names of folders.
 using ChannelPlace = std::array<std::string, 3>;
 
-// The name of a folder or a file for what a caller gave. KESTO_INVALID_ARGUMENT, KESTO_INVALID_UTF8 or KESTO_TOO_LARGE
-// for what no channel can be called.
+// The name of a folder or a file for a caller's name. KESTO_INVALID_ARGUMENT, KESTO_INVALID_UTF8 or KESTO_TOO_LARGE if
+// a channel cannot have that name.
 [[nodiscard]] std::expected<std::string, kesto_status> channelFileName(const char* given);
-// The same for a group or a subgroup, of which null means that there is none.
+// The same for a group or a subgroup, where null means none.
 [[nodiscard]] std::expected<std::string, kesto_status> channelGroupName(const char* given);
 // Text without control characters, for a line of a file: units and names of states.
 [[nodiscard]] std::expected<std::string, kesto_status> channelText(const char* given);
 
-// Where the tree is by default. Reads the environment.
+// The default path of the tree. Reads the environment.
 [[nodiscard]] std::string usualChannelRoot();
 
 // One folder with channels. One thread at a time. Functions that return an int return 0 or an `errno`.
 class ChannelFolder {
 public:
-    // `temporaryName` is under what name a new file is written: hidden, and of nobody else. The claim is the
-    // publisher's to this driver.
+    // New files are written as `temporaryName`, which is hidden and belongs to this publisher alone. `claim` is the
+    // publisher's claim to this driver.
     ChannelFolder(std::string root, ChannelPlace place, std::string temporaryName, std::shared_ptr<DriverClaim> claim);
-    // Removes the folders that are empty. The claim ends with the last folder that holds it.
+    // Removes empty folders. The claim ends with the last folder that holds it.
     ~ChannelFolder();
     ChannelFolder(const ChannelFolder&) = delete;
     ChannelFolder& operator=(const ChannelFolder&) = delete;

@@ -1,4 +1,4 @@
-// What is left of others is found by looking through the driver's folders, since nobody else knows where they were.
+// The files of dead publishers are found by a search through the driver's folders, because no list of them exists.
 #include "channels/DriverClaim.h"
 
 #include "platform/linux/channels/ChannelOwner.h"
@@ -22,7 +22,7 @@ std::vector<std::string> namesIn(int folder)
     return platform::namesIn(folder, std::numeric_limits<std::size_t>::max()).value_or(std::vector<std::string>());
 }
 
-// A folder in which nobody but this user and the administrator can exchange anything.
+// Opens a folder in which only this user and the administrator can replace files.
 FileDescriptor openOwn(int parent, const std::string& name)
 {
     auto folder = platform::openDirectoryAt(parent, name);
@@ -41,7 +41,7 @@ public:
         const auto names = namesIn(driver_);
         for (const std::string& name : names)
             clearGroup(name);
-        for (const std::string& name : names) // last: they are what the others are known by
+        for (const std::string& name : names) // last, because the other files are recognised by them
             if (isGone(platform::ownerOfChannelOwnerFile(name)))
                 remove(driver_, name);
     }
@@ -57,7 +57,7 @@ private:
             ::unlinkat(driver_, name.c_str(), AT_REMOVEDIR); // if it is empty
     }
 
-    // Whether something was removed.
+    // Returns whether something was removed.
     bool clearSubgroup(int group, const std::string& name)
     {
         const FileDescriptor subgroup = openOwn(group, name);
@@ -71,7 +71,7 @@ private:
         return isClearer;
     }
 
-    // Valid until the next one.
+    // Valid until the next call.
     std::string_view ownerOfChannel(int folder, const std::string& name)
     {
         text_ = platform::readFileAt(folder, name, longestLine).value_or(std::string());
@@ -100,7 +100,7 @@ private:
 
     const int driver_;
     std::string text_;
-    std::map<std::string, bool, std::less<>> owners_; // whether they are gone
+    std::map<std::string, bool, std::less<>> owners_; // whether each has ended
 };
 
 } // namespace

@@ -1,7 +1,7 @@
-// A publisher's claim to what it writes below one driver: an owner file, whose lock tells that the publisher lives.
+// A publisher's claim to its files below one driver: an owner file, whose lock shows that the publisher lives.
 //
-// Whoever claims a driver clears away what publishers of this user left there that live no more: channels, files in the
-// making and owner files, and the folders that are empty then.
+// A publisher that claims a driver removes the files of this user's dead publishers there: channels, unfinished files
+// and owner files, and folders that become empty.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -14,19 +14,19 @@ namespace libkesto {
 // One thread at a time.
 class DriverClaim {
 public:
-    // `owner` is what the publisher calls itself.
+    // `owner` is the publisher's name for itself.
     explicit DriverClaim(std::string owner);
     // Removes the owner file.
     ~DriverClaim();
     DriverClaim(const DriverClaim&) = delete;
     DriverClaim& operator=(const DriverClaim&) = delete;
 
-    // Claims the driver's folder, which belongs to this user or the administrator, unless that holds already. Where the
+    // Claims the driver's folder, which belongs to this user or the administrator, unless it is claimed already. If the
     // owner file cannot be made, files name no owner. May throw std::bad_alloc.
     void renew(int driverFolder);
-    // Whether somebody has removed the owner file.
+    // Whether another process has removed the owner file.
     [[nodiscard]] bool isLost() const noexcept;
-    // What files begin with; empty where nothing is claimed.
+    // The first line of files; empty without a claim.
     [[nodiscard]] std::string_view line() const noexcept { return line_; }
 
 private:

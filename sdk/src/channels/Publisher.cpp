@@ -1,5 +1,5 @@
-// One lock for the list of channels and their files. Changes never take it: they go through the channel's own mark and
-// the bell.
+// One lock protects the list of channels and their files. Changes of values never take it: they use the channel's own
+// mark and the bell.
 #include "channels/Publisher.h"
 
 #include "BlockedSignals.h"
@@ -16,7 +16,7 @@ namespace {
 using libkesto::ChannelClock;
 using std::chrono::milliseconds;
 
-constexpr int shareOfTime = 20; // the thread writes for a twentieth of its time at most
+constexpr int shareOfTime = 20; // the thread writes for at most a twentieth of its time
 constexpr milliseconds pauseAfterFailure(5000);
 constexpr milliseconds longestPause(60'000);
 
@@ -73,7 +73,7 @@ kesto_publisher::~kesto_publisher()
 void kesto_publisher::run() noexcept
 {
     pthread_setname_np(pthread_self(), "libkesto-files");
-    while (!isEnding_.load()) { // whose ring may have been heard while resting
+    while (!isEnding_.load()) { // its ring may have come during the rest
         sleepUntilNeeded();
         if (isEnding_.load())
             return;
@@ -99,7 +99,7 @@ void kesto_publisher::sleepUntilNeeded() noexcept
 {
     constexpr int forever = -1;
     int pause = forever;
-    bell_.fallAsleep(); // and only then look
+    bell_.fallAsleep(); // before the check for changes
     {
         const foundation::Lock lock(lock_);
         if (std::ranges::any_of(channels_, [](const Published& each) { return each.channel->isChanged(); }))
@@ -130,7 +130,7 @@ int kesto_publisher::write(bool isRefresh) noexcept
 
 int kesto_publisher::write(Published& published, Time now) noexcept
 {
-    published.channel->setChanged(false); // before its value is read: what changes from here on is for the next time
+    published.channel->setChanged(false); // before its value is read: later changes are written next time
     int error = 0;
     try {
         text_.clear();
@@ -180,7 +180,7 @@ std::expected<kesto_channel*, kesto_status> kesto_publisher::add(std::unique_ptr
             return added;
         ++timedChannels_;
     }
-    bell_.ring(); // the thread has to look at the clock from now on
+    bell_.ring(); // from now on the thread needs time-outs
     return added;
 }
 

@@ -1,8 +1,8 @@
-// What owns channels: writes their files, by a thread of its own and for whoever asks, and takes them away again.
+// The owner of channels: writes their files, on a thread of its own and on request, and removes them.
 //
-// The thread sleeps until the first change, writes what has changed, and rests: so a file is never written more often
-// than once an interval, and a change after a quiet time is seen at once. It rests longer when there is more to
-// write than it should spend its time with, and when files cannot be written.
+// The thread sleeps until the first change, writes the changed channels, and rests: so a file is written at most once
+// in an interval, and a change after a quiet time is visible at once. It rests longer if writing takes too much of its
+// time, and if files cannot be written.
 #pragma once
 
 #include "Counters.h"
@@ -39,14 +39,13 @@ public:
     using Settings = libkesto::PublisherSettings;
     using Time = kesto_channel::Time;
 
-    // Null, with `errno`, when the system has no descriptor or no thread. May throw std::bad_alloc.
+    // Null, with `errno`, if the system refuses a descriptor or a thread. May throw std::bad_alloc.
     [[nodiscard]] static std::unique_ptr<kesto_publisher> create(Settings settings);
     ~kesto_publisher();
     kesto_publisher(const kesto_publisher&) = delete;
     kesto_publisher& operator=(const kesto_publisher&) = delete;
 
-    // Whether this process made it. In a child that was forked off, the thread, the lock and the files are the
-    // parent's.
+    // Whether this process made it. In a forked child the thread, the lock and the files belong to the parent.
     [[nodiscard]] bool isOfThisProcess() const noexcept { return process_ == ::getpid(); }
     // What channels tell their changes.
     [[nodiscard]] libkesto::Doorbell& bell() noexcept { return bell_; }
@@ -55,7 +54,7 @@ public:
                                                                   libkesto::ChannelPlace place, std::string name);
     // Destroys the channel and removes its file.
     void remove(const kesto_channel& channel) noexcept;
-    // Writes whatever may not be up to date in the files. KESTO_SYSTEM_ERROR, with `errno`, when a file cannot be.
+    // Writes every file that may be out of date. KESTO_SYSTEM_ERROR, with `errno`, if a file cannot be written.
     [[nodiscard]] kesto_status flush() noexcept;
     [[nodiscard]] kesto_publisher_statistics statistics() const noexcept;
     [[nodiscard]] const std::string& root() const noexcept { return settings_.root; }
@@ -78,7 +77,7 @@ private:
     int write(Published& published, Time now) noexcept KESTO_REQUIRES(lock_);
     [[nodiscard]] std::shared_ptr<libkesto::ChannelFolder> folder(libkesto::ChannelPlace place) KESTO_REQUIRES(lock_);
 
-    const pid_t process_; // that made it
+    const pid_t process_; // the one that made it
     const Settings settings_;
     const std::string owner_; // what it calls itself in its files
     libkesto::Doorbell bell_;

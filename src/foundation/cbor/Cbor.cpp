@@ -58,8 +58,8 @@ char* putHead(Major major, std::uint64_t argument, char* place) noexcept
     return putBigEndian(argument, place);
 }
 
-// Makes the text longer by what `put` writes to the place it is given, `most` bytes at most; it returns where it
-// stopped. One step on the string instead of one a byte.
+// Appends the bytes that `put` writes to its argument, at most `most`; `put` returns the end of its bytes. This changes
+// the string once, and not once for each byte.
 template <typename Put> void append(std::size_t most, std::string& out, Put put)
 {
     out.resize_and_overwrite(out.size() + most, [&put, before = out.size()](char* bytes, std::size_t) {
@@ -248,19 +248,19 @@ char* putCbor(const Dictionary& dictionary, char* place) noexcept
 
 namespace {
 
-// The keys of a map that is being read. While they are those of a shape that came before, none is made.
+// The keys of a map that is being read. As long as they equal those of an earlier shape, no key is made.
 class MapKeys {
 public:
     [[nodiscard]] bool empty() const { return taken_ == 0 && own_.empty(); }
 
-    // Looks for the shape at this place, and leaves there what comes instead.
+    // Expects the keys of the shape at this place; if the map has other keys, their shape replaces it there.
     void expect(Reference<DictionaryShape>& place)
     {
         place_ = &place;
         expected_ = place;
     }
 
-    // Whether this is the key that is expected next.
+    // Whether this is the next expected key; if so, takes it.
     bool takeExpected(std::string_view key)
     {
         if (!own_.empty() || !expected_ || taken_ == expected_->keys().size() || expected_->keys()[taken_] != key)
@@ -275,7 +275,7 @@ public:
         own_.push_back(std::move(key));
     }
 
-    // What they make of as many values.
+    // The dictionary of these keys and as many values.
     Dictionary dictionary(std::span<Value> values) &&
     {
         if (empty())
@@ -302,8 +302,8 @@ private:
     std::vector<String> own_; // all of them, once one was not expected
 };
 
-// What the containers that are being read have so far, one behind the other. One a thread rather than one a decoder,
-// of which there are as many as clients.
+// The elements of the containers that are being read, one container after the other. One vector a thread and not one a
+// decoder, because every client has a decoder.
 std::vector<Value>& unfinishedValues()
 {
     thread_local std::vector<Value> values;
@@ -318,7 +318,7 @@ class CborReader {
 public:
     CborReader(std::string_view bytes, CborDecoder& decoder) : rest_(bytes), decoder_(decoder)
     {
-        values_.clear(); // of one that ran out of memory
+        values_.clear(); // left by a reading that ran out of memory
     }
 
     std::expected<Value, CborError> readAll(unsigned maximumDepth)
@@ -410,7 +410,7 @@ private:
         }
     }
 
-    // What is whole with its head: integers and the simple values. Null for all else.
+    // A value that its head holds completely: integers and the simple values. Null for all others.
     Value readScalar(const Head& head) noexcept
     {
         if (const auto number = cborNumber(head))
@@ -425,7 +425,7 @@ private:
         return refuse(wellFormed ? CborError::Unsupported : CborError::Malformed);
     }
 
-    // Inside an indefinite length: whether the break is next, which is then taken.
+    // Inside an indefinite length: whether the next byte is the break; if so, takes it.
     bool takeBreak() noexcept
     {
         if (!rest_.starts_with(breakByte))
@@ -444,7 +444,7 @@ private:
         }
     }
 
-    // Those of an indefinite length are gathered in `chunks_`, which lasts until the next string.
+    // The chunks of a string of indefinite length are joined in `chunks_`, which is valid until the next string.
     std::string_view readBytes(const Head& head)
     {
         if (!head.isIndefinite())
@@ -462,7 +462,8 @@ private:
         return chunks_;
     }
 
-    // Whether what `readBytes` returned for a text is one. Of an indefinite length, its chunks are.
+    // Whether the bytes that `readBytes` returned for a text are UTF-8. The chunks of an indefinite length have been
+    // checked.
     [[nodiscard]] static bool isText(const Head& head, std::string_view bytes) noexcept
     {
         return head.isIndefinite() || isValidUtf8(bytes);
@@ -476,7 +477,7 @@ private:
         return text;
     }
 
-    // One that is expected or remembered was looked at when it came first.
+    // An expected or remembered key was checked when it came first.
     void readKey(const Head& map, MapKeys& keys)
     {
         const Head head = readHead();
@@ -543,7 +544,7 @@ std::expected<Value, CborError> CborDecoder::decode(std::string_view bytes, unsi
 
 namespace {
 
-// Eight characters at a time, the last eight perhaps overlapping those before.
+// Eight characters at a time; the last eight may overlap the eight before.
 std::uint64_t hashOf(std::string_view key) noexcept
 {
     constexpr std::uint64_t multiplier = 0x9E3779B97F4A7C15; // odd, its bits well mixed

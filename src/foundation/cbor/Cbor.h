@@ -1,9 +1,9 @@
 // Values as CBOR (RFC 8949): the language of the wire, and the compact form in which a session keeps its
 // messages.
 //
-// Read by own code rather than by a library, because the same few lines decode a frame from a hostile
-// client, remember the keys that a client repeats in every message, and walk a recorded payload
-// without unpacking it; the benchmarks set it beside libcbor.
+// The reader is the project's own and not a library's, because the same few lines decode a frame from a hostile client,
+// remember the keys that a client repeats in every message, and walk a recorded payload without unpacking it; the
+// benchmarks compare it with libcbor.
 //
 // Null, booleans, integers, floats (16 bits are read as 32), text, arrays, maps with text keys, byte strings
 // (data) and epoch-based dates (tag 1) have a value; lengths may be indefinite. Everything else is refused.
@@ -24,7 +24,7 @@ namespace foundation {
 enum class CborError : std::uint8_t {
     Truncated, // the bytes end inside an item
     TrailingBytes, // bytes follow the item
-    TooDeep, // more containers inside each other than allowed
+    TooDeep, // more nested containers than allowed
     Malformed, // not well-formed CBOR
     InvalidUtf8, // text that is not UTF-8
     KeyNotText, // a map key of another type
@@ -32,7 +32,7 @@ enum class CborError : std::uint8_t {
     IntegerOutOfRange // below -2^63
 };
 
-// The error as words for a log line, such as "text is not valid UTF-8".
+// The error as text for a log line, such as "text is not valid UTF-8".
 [[nodiscard]] std::string_view description(CborError error) noexcept;
 
 // How deep foreign bytes may nest.
@@ -46,7 +46,7 @@ void appendCbor(const Dictionary& dictionary, std::string& out);
 [[nodiscard]] std::size_t cborSize(const Dictionary& dictionary) noexcept;
 char* putCbor(const Dictionary& dictionary, char* place) noexcept;
 
-// The heads by which whoever knows a message's shape encodes it without building values first.
+// The heads, for code that knows a message's shape and encodes the message without building values.
 void appendCborInteger(std::uint64_t value, std::string& out);
 void appendCborText(std::string_view text, std::string& out);
 void appendCborArrayHead(std::uint64_t count, std::string& out);
@@ -57,10 +57,10 @@ inline void appendCborNull(std::string& out)
 }
 
 // Decodes items from foreign bytes. One decoder a connection, used by one thread at a time: it remembers short keys and
-// the shapes of small maps, so that what every message repeats is made once.
+// the shapes of small maps, so that keys that every message repeats are made once.
 class CborDecoder {
 public:
-    // The one item that the bytes hold, all of them, with at most so many containers inside each other.
+    // Decodes the bytes, which hold exactly one item with at most so many nested containers.
     [[nodiscard]] std::expected<Value, CborError> decode(std::string_view bytes,
                                                          unsigned maximumDepth = cborMaximumDepth);
 
@@ -77,7 +77,7 @@ private:
     static constexpr std::size_t longestRememberedKey = 64;
     static constexpr std::size_t rememberedKeys = 256;
     static constexpr std::size_t rememberedShapes = 16;
-    std::vector<String> keys_; // from the first key on, by a hash of their characters; a newcomer takes the place
+    std::vector<String> keys_; // by a hash of their characters; a new key replaces the one at its place
     std::array<Reference<DictionaryShape>, rememberedShapes> shapes_; // by a hash, too
 };
 

@@ -1,5 +1,4 @@
-// The head that every CBOR item begins with: what kind of item it is, and one number. For whoever reads or writes
-// encoded items in this folder.
+// The head of every CBOR item: the kind of the item, and one number. For the readers and writers of this folder.
 #pragma once
 
 #include "foundation/values/Number.h"
@@ -26,7 +25,7 @@ struct CborHead {
     [[nodiscard]] bool isIndefinite() const noexcept { return additional == indefiniteLength; }
 };
 
-// The integer that those bytes are, the highest first.
+// The integer of those bytes, the highest first.
 template <typename Integer> [[nodiscard]] Integer cborBigEndian(const char* bytes) noexcept
 {
     Integer value;
@@ -34,8 +33,8 @@ template <typename Integer> [[nodiscard]] Integer cborBigEndian(const char* byte
     return std::endian::native == std::endian::little ? std::byteswap(value) : value;
 }
 
-// The number that is whole with its head; nothing when the head begins something else. Floats of 16 bits, which we
-// never write, and integers below -2^63 are left to the reader.
+// The number, if the head holds it completely; nothing for any other head. Floats of 16 bits, which we never write, and
+// integers below -2^63 are left to the reader.
 [[nodiscard]] inline std::optional<Number> cborNumber(const CborHead& head) noexcept
 {
     const bool fitsSigned = std::in_range<std::int64_t>(head.argument);

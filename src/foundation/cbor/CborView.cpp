@@ -1,11 +1,11 @@
-// What is too much for a header: sizes of containers, and values that have to be built.
+// The slower functions: sizes of containers, and values that have to be built.
 #include "foundation/cbor/CborView.h"
 
 #include "foundation/cbor/Cbor.h"
 
 namespace foundation {
 
-// Without recursion: counts the items that are still to come.
+// Without recursion: counts the items that remain.
 std::size_t CborItem::nestedSizeAt(const char* place) noexcept
 {
     std::size_t size = 0;

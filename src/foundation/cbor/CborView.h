@@ -1,9 +1,8 @@
 // Looking into encoded values without decoding them.
 //
-// A session keeps its messages encoded, and what it derives from them needs a few keys of each of a million
-// messages. Walking over the bytes finds them at a fraction of the cost of unpacking, and without memory; what every
-// step does is inline.
-// Only for bytes that `appendCbor` wrote: nothing is checked.
+// A session keeps its messages encoded, and its results need a few keys of each of a million messages. Walking over the
+// bytes finds these keys at a fraction of the cost of unpacking, and without memory; the functions of every step are
+// inline. Only for bytes that `appendCbor` wrote: these functions check nothing.
 #pragma once
 
 #include "foundation/cbor/CborHead.h"
@@ -19,10 +18,10 @@ namespace foundation {
 // One encoded value. Valid as long as the bytes. Any thread.
 class CborItem {
 public:
-    // No value: it has no bytes and answers nothing else.
+    // No value: only `bytes` may be called, and returns none.
     constexpr CborItem() noexcept = default;
     constexpr explicit CborItem(std::string_view bytes) noexcept : bytes_(bytes) { }
-    // The item that stands there, whatever follows it.
+    // The item at that place; other bytes may follow it.
     static CborItem at(const char* place) noexcept { return CborItem({place, sizeAt(place)}); }
 
     [[nodiscard]] std::string_view bytes() const noexcept { return bytes_; }
@@ -41,8 +40,7 @@ public:
     [[nodiscard]] std::string text() const { return value().text(); }
     // The value unpacked.
     [[nodiscard]] Value value() const;
-    // What stands behind the head: the bytes of a string, the elements of an array, the keys and values of a
-    // dictionary.
+    // The bytes behind the head: those of a string, of an array's elements, or of a dictionary's keys and values.
     [[nodiscard]] std::string_view content() const noexcept { return bytes_.substr(headAt(bytes_.data()).size); }
 
 private:
@@ -83,7 +81,7 @@ private:
     std::string_view bytes_;
 };
 
-// What an encoded array holds, or what an encoded dictionary holds, keys and values in turn.
+// The items of an encoded array, or of an encoded dictionary: keys and values in turn.
 class CborItems {
 public:
     class Iterator {

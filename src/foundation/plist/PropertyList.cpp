@@ -1,4 +1,4 @@
-// Tells the forms apart; each has a reader of its own. XML in UTF-16 becomes UTF-8 before it is read.
+// Recognises the form; each form has a reader of its own. XML in UTF-16 becomes UTF-8 before it is read.
 #include "foundation/plist/PropertyList.h"
 
 #include "foundation/plist/PropertyListReader.h"
@@ -7,8 +7,8 @@
 namespace foundation {
 namespace {
 
-// The order of the bytes of XML in UTF-16: that of its byte order mark or, without one, of the "<" with which it
-// begins. Nothing for anything else.
+// The order of the bytes of XML in UTF-16: from its byte order mark or else from its first character, "<". Nothing for
+// other files.
 std::optional<std::endian> utf16Order(std::string_view bytes)
 {
     using namespace std::string_view_literals;
@@ -32,7 +32,7 @@ std::expected<Value, PropertyListFailure> readPropertyList(std::string_view byte
 {
     using enum PropertyListError;
     if (bytes.empty())
-        return std::unexpected(PropertyListFailure{Malformed, "there are no bytes"});
+        return std::unexpected(PropertyListFailure{Malformed, "the file is empty"});
     if (bytes.size() > limits.bytes)
         return std::unexpected(PropertyListFailure{TooLarge, format("more than {} bytes", limits.bytes)});
     return bytes.starts_with("bplist") ? readBinaryPropertyList(bytes, limits) : readXml(bytes, limits);

@@ -1,11 +1,11 @@
 // The binary form: objects in any order, a table of where each begins, and at the end a trailer that says where the
 // table is. Containers name their elements by their numbers in the table.
 //
-// So an object may be part of several, and of itself. What contains itself is refused. What is shared is read again
-// wherever it is referred to, and counts there like any other: the few bytes that would become a billion objects become
-// no more than are allowed. Only text and data are made once and shared, and their bytes count too.
+// So an object may be part of several others, and of itself. The reader refuses an object that contains itself. It
+// reads a shared object again at each reference and counts it each time, so that a few bytes cannot become a billion
+// objects. It makes only text and data once and shares them, but counts their bytes at each reference, too.
 //
-// Nothing is believed before it is seen to lie within the file.
+// The reader checks that every place lies within the file before it reads there.
 #include "foundation/plist/PropertyListReader.h"
 #include "foundation/text/Format.h"
 
@@ -19,7 +19,7 @@ namespace {
 
 using enum PropertyListError;
 
-// Of up to 64 bits; of more, the lower ones.
+// The number of up to 8 bytes; of more bytes, the lower 64 bits.
 std::uint64_t bigEndian(std::string_view bytes) noexcept
 {
     std::uint64_t value = 0;
@@ -49,7 +49,7 @@ private:
     struct Object {
         std::uint64_t number;
         std::uint64_t offset; // in the file
-        std::string_view rest; // from what is not read yet to the end of all objects
+        std::string_view rest; // from the first unread byte to the end of all objects
     };
 
     Value fail(const Object& object, PropertyListError error, std::string_view what)
@@ -63,7 +63,7 @@ private:
     }
     [[nodiscard]] std::string tooManyObjects() const { return format("more than {} objects", limits_.objects); }
 
-    // The number of the object that is the whole list.
+    // Returns the number of the root object.
     std::uint64_t readTrailer()
     {
         constexpr std::size_t headerSize = 8;
@@ -98,10 +98,10 @@ private:
     {
         constexpr std::uint64_t firstOffset = 8;
         if (number >= leaves_.size())
-            return failWith(Malformed, format("object {}: there is no such object", number));
+            return failWith(Malformed, format("object {}: this object does not exist", number));
         Object object{number, bigEndian(offsets_.substr(number * offsetSize_, offsetSize_)), {}};
         if (object.offset < firstOffset || object.offset >= objects_.size())
-            return fail(object, Malformed, "that is no place of objects");
+            return fail(object, Malformed, "that is not a place of objects");
         if (!leaves_[number].isNull())
             return useLeaf(object);
         object.rest = objects_.substr(object.offset);
@@ -143,14 +143,14 @@ private:
         return taken;
     }
 
-    // The length of what has one: it stands in the marker, or behind it as an integer.
+    // The length of an object that has one: it is in the marker, or behind it as an integer.
     std::uint64_t takeCount(Object& object, unsigned detail)
     {
         if (detail != 0xF)
             return detail;
         const auto marker = static_cast<unsigned>(bigEndian(take(object, 1)));
         if (marker < 0x10 || marker > 0x13) {
-            fail(object, Malformed, "its length is no integer of at most 64 bits");
+            fail(object, Malformed, "its length is not an integer of at most 64 bits");
             return 0;
         }
         return bigEndian(take(object, std::uint64_t{1} << (marker & 0xF)));
@@ -166,7 +166,7 @@ private:
         }
     }
 
-    // Those below 8 bytes have no sign, those of 16 are what unsigned ones of 64 bits need.
+    // Integers below 8 bytes have no sign; unsigned integers of 64 bits have 16 bytes.
     Value readInteger(Object& object, unsigned detail)
     {
         if (detail > 4)
@@ -271,14 +271,14 @@ private:
         for (std::uint64_t index = 0; index < count && !failed(); ++index) {
             const auto key = readObject(referenceAt(keys, index), depth - 1).string();
             if (!key)
-                return fail(object, Malformed, "a key that is no string");
+                return fail(object, Malformed, "a key that is not a string");
             entries.push_back({*key, readObject(referenceAt(values, index), depth - 1)});
         }
         isOpen_[object.number] = false;
         return Dictionary(std::move(entries));
     }
 
-    // Whether the container may be read, with so many elements. It is open until they are.
+    // Whether the container, with so many elements, may be read. It is open until its elements are read.
     bool open(const Object& object, unsigned depth, std::uint64_t elements)
     {
         if (failed())
@@ -304,7 +304,7 @@ private:
     std::size_t offsetSize_ = 0;
     std::size_t referenceSize_ = 0;
     std::vector<bool> isOpen_; // containers that are being read
-    std::vector<Value> leaves_; // text and data that have been read; null for all else
+    std::vector<Value> leaves_; // text and data that have been read; null for other objects
     std::size_t contentLeft_;
 };
 

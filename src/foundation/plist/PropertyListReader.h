@@ -1,5 +1,5 @@
-// What the readers of both forms of property lists have in common, for them alone: the first failure ends the reading,
-// what they make is counted, and characters become UTF-8.
+// The common part of the readers of both forms, only for them: the first failure ends the reading, the objects are
+// counted, and characters become UTF-8.
 #pragma once
 
 #include "foundation/plist/PropertyList.h"
@@ -11,12 +11,12 @@
 
 namespace foundation {
 
-// After a failure every step does nothing and yields null, so that only loops look whether there was one.
+// After a failure every step does nothing and returns null, so that only loops check for a failure.
 class PropertyListReader {
 protected:
     explicit PropertyListReader(const PropertyListLimits& limits) : limits_(limits), objectsLeft_(limits.objects) { }
 
-    // Null, for whoever has a value to return. Of several failures the first counts.
+    // Returns null, so that a function can return it as its value. Of several failures the first counts.
     Value failWith(PropertyListError error, std::string text)
     {
         if (!failure_)
@@ -32,7 +32,7 @@ protected:
         return value;
     }
 
-    // Takes so many objects off what may still be made; false when that are too many.
+    // Subtracts so many objects from the rest of the limit; false when these are too many.
     [[nodiscard]] bool spendObjects(std::uint64_t count) noexcept
     {
         if (count > objectsLeft_)
@@ -48,15 +48,15 @@ private:
     std::optional<PropertyListFailure> failure_;
 };
 
-// Signed where that holds it, so that one integer has one kind, however it was written.
+// Signed if that kind can hold it, so that one integer has one kind in all forms.
 inline Number propertyListInteger(std::uint64_t value) noexcept
 {
     return std::in_range<std::int64_t>(value) ? Number(static_cast<std::int64_t>(value)) : Number(value);
 }
 
-// False, and nothing appended, for what is no Unicode character.
+// For a number that is not a Unicode character it returns false and appends nothing.
 [[nodiscard]] bool appendUtf8(std::uint32_t character, std::string& out);
-// Nothing for what is not well-formed. A byte order mark is a character like any other.
+// Nothing if the bytes are not well-formed. A byte order mark is a character like any other.
 [[nodiscard]] std::optional<std::string> utf8FromUtf16(std::string_view bytes, std::endian order);
 
 [[nodiscard]] std::expected<Value, PropertyListFailure> readXmlPropertyList(std::string_view bytes,

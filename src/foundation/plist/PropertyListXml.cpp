@@ -1,8 +1,8 @@
-// The XML form. pugixml cuts the document into elements and texts; what they mean is decided here.
+// The XML form. pugixml cuts the document into elements and texts; this file interprets them.
 //
-// It skips the document type without looking into it, and leaves references as they stand: the five that XML has and
-// numbers of characters are resolved here, any other is refused. So a document says nothing that is not in it, and
-// yields no more text than it has bytes in UTF-8.
+// pugixml skips the document type without reading it, and leaves references as they are: this file resolves XML's own
+// five and character numbers, and refuses all others. So a document cannot include anything from outside, and yields no
+// more text than it has bytes in UTF-8.
 #include "foundation/plist/PropertyListReader.h"
 #include "foundation/text/Format.h"
 
@@ -62,7 +62,7 @@ std::optional<Number> parseReal(std::string_view text)
     return value ? std::optional(Number(*value)) : std::nullopt;
 }
 
-// "2026-03-01T12:30:00Z", in which the parts behind the year may be missing from the end on.
+// "2026-03-01T12:30:00Z"; the last parts may be missing, down to the year alone.
 std::optional<Date> parseDate(std::string_view text)
 {
     constexpr std::string_view separators = "--T::";
@@ -119,13 +119,13 @@ std::optional<Data> parseBase64(std::string_view text)
     return Data{String(bytes)};
 }
 
-// What its element says already.
+// The value that the element's name gives, if the element is empty.
 template <bool value> std::optional<Number> parseNothing(std::string_view text)
 {
     return text.empty() ? std::optional(Number(value)) : std::nullopt;
 }
 
-// Appends what the reference, without its "&" and ";", stands for.
+// Appends the character of the reference, which is given without "&" and ";".
 bool appendReferred(std::string_view reference, std::string& out)
 {
     if (reference.starts_with('#')) {
@@ -153,11 +153,11 @@ public:
 
     std::expected<Value, PropertyListFailure> read()
     {
-        // pugixml takes a NUL for the end and does not look at what characters are made of.
+        // pugixml takes a NUL for the end and does not check the encoding.
         if (!isValidUtf8(bytes_) || bytes_.contains('\0'))
-            return outcome(failWith(InvalidText, "the file is no text in UTF-8 or UTF-16"));
+            return outcome(failWith(InvalidText, "the file is not text in UTF-8 or UTF-16"));
         pugi::xml_document document;
-        // With the blanks of texts, and with texts outside of the document's element: those are refused here.
+        // pugixml keeps blanks, and text outside of the document's element, which this reader then refuses.
         constexpr unsigned options = pugi::parse_cdata | pugi::parse_eol | pugi::parse_ws_pcdata | pugi::parse_fragment;
         const auto parsed = document.load_buffer(bytes_.data(), bytes_.size(), options, pugi::encoding_utf8);
         if (parsed.status == pugi::status_out_of_memory)
@@ -168,10 +168,10 @@ public:
     }
 
 private:
-    // The line, from 1, says where to look.
+    // Adds the line of the error, counted from 1.
     Value failAt(std::ptrdiff_t offset, PropertyListError error, std::string_view what)
     {
-        if (failed()) // of several failures the first counts, and only it is put into words
+        if (failed()) // of several failures the first counts, and only it gets a text
             return {};
         const auto before = bytes_.substr(0, static_cast<std::size_t>(std::max<std::ptrdiff_t>(offset, 0)));
         return failWith(error, format("line {}: {}", 1 + std::ranges::count(before, '\n'), what));
@@ -185,7 +185,7 @@ private:
     {
         const pugi::xml_node list = onlyElement(document);
         if (nameOf(list) != "plist")
-            return fail(list, Malformed, "the document is no property list");
+            return fail(list, Malformed, "the document is not a property list");
         const pugi::xml_node value = onlyElement(list);
         return failed() ? Value() : readValue(value, limits_.depth);
     }
@@ -272,7 +272,7 @@ private:
         return String(readText(element));
     }
 
-    // What all texts inside say together.
+    // All texts inside, joined.
     std::string readText(pugi::xml_node element)
     {
         std::string text;
@@ -282,7 +282,7 @@ private:
             else if (child.type() == pugi::node_cdata)
                 text += child.value();
             else if (!appendResolved(child.value(), text))
-                fail(child, InvalidText, "a reference to something that is no character");
+                fail(child, InvalidText, "a reference that is not to a character");
         }
         return text;
     }

@@ -1,4 +1,4 @@
-// What every record of protocol buffers can do: be read, be written, and be shown.
+// The operations of every protocol-buffers record: reading, writing and formatting.
 #pragma once
 
 #include "foundation/protobuf/ProtobufReader.h"
@@ -15,8 +15,8 @@ class ProtobufMessage {
 public:
     virtual ~ProtobufMessage() = default;
 
-    // Takes over every field that it knows, up to the end of the input: of one that comes again the last counts, and
-    // one that does not come stays as it is. When the input is broken, the fields before that place have been taken.
+    // Reads every field that it knows, up to the end of the input. Of a repeated field the last counts; a missing field
+    // keeps its value. If the input is broken, the fields before the error have been read.
     [[nodiscard]] virtual std::expected<void, ProtobufError> readFrom(ProtobufReader& reader) = 0;
     virtual void writeTo(ProtobufWriter& writer) const = 0;
     // As an object of that name, its fields in the order of their names.

@@ -1,5 +1,5 @@
-// Each step takes something from the front and says whether it was there. The first that fails empties the rest, so
-// that every loop ends by itself.
+// Each step takes something from the front and returns whether it was complete. The first step that fails empties the
+// rest, so that every loop ends by itself.
 #include "foundation/protobuf/ProtobufReader.h"
 
 #include <array>
@@ -37,7 +37,7 @@ template <typename Integer> bool ProtobufReader::takeLongVarint(Integer& value) 
     Integer taken = 0;
     for (int shift = 0; at_ != end_; shift += 7) {
         const auto byte = static_cast<std::uint8_t>(*at_++);
-        if (shift == lastShift && byte >> (bits - lastShift) != 0) // one that follows is too much as well
+        if (shift == lastShift && byte >> (bits - lastShift) != 0) // a further byte is too much as well
             return fail(ProtobufError::VarintTooLong);
         taken |= static_cast<Integer>(byte & 0x7F) << shift;
         if (byte < 0x80) {
@@ -62,7 +62,7 @@ template <typename Integer> bool ProtobufReader::takeFixed(std::uint64_t& value)
     return true;
 }
 
-// A group that has begun, up to its end.
+// Takes the rest of a group, up to its end.
 bool ProtobufReader::takeGroup(std::uint32_t number, std::string_view& content) noexcept
 {
     const char* const begin = at_;

@@ -1,9 +1,9 @@
 // Reading the wire format of protocol buffers, in which a message is a row of fields: a number, a wire type, and a
-// value whose length the wire type tells.
+// value whose length the wire type determines.
 //
-// The reader takes field by field, each with its whole value, so that whoever reads picks the fields that it knows and
-// has passed the others already. It copies and allocates nothing: text lies in the input. It believes no length
-// before the bytes are there, and does not recurse, however deep groups nest.
+// The reader returns field by field, each with its whole value, so that a caller picks the fields that it knows and can
+// ignore the others. It copies and allocates nothing: text lies in the input. It checks every length against the
+// remaining bytes, and does not recurse into nested groups.
 #pragma once
 
 #include <cstdint>
@@ -19,10 +19,10 @@ enum class ProtobufError : std::uint8_t {
     VarintTooLong, // a number that does not end in time, or takes more bits than its place has
     InvalidTag, // a field without a number, or of a wire type that does not exist
     UnmatchedEndGroup, // the end of a group that did not begin, or of another one
-    TooDeep // more groups inside each other than allowed
+    TooDeep // more nested groups than allowed
 };
 
-// The error as words for a log line, such as "the message ends inside a field".
+// The error as text for a log line, such as "the message ends inside a field".
 [[nodiscard]] std::string_view description(ProtobufError error) noexcept;
 
 // How the value of a field is written; the numbers are those of the wire.
@@ -35,7 +35,7 @@ struct ProtobufField {
     std::string_view bytes; // of LengthDelimited; of Group the fields in it, which are well-formed
 };
 
-// One thread at a time. The bytes outlive the reader, and the fields that it gave.
+// One thread at a time. The bytes must outlive the reader and the fields that it returns.
 class ProtobufReader {
 public:
     // As many as other implementations allow.
@@ -43,9 +43,9 @@ public:
 
     explicit ProtobufReader(std::string_view bytes) noexcept : at_(bytes.data()), end_(bytes.data() + bytes.size()) { }
 
-    // The next field; nothing when there is none, or when what follows is broken.
+    // The next field; nothing at the end, or if the next bytes are broken.
     [[nodiscard]] std::optional<ProtobufField> next() noexcept;
-    // Whether all fields so far were well-formed, and if not, what ended the reading.
+    // Success if all fields so far were well-formed, else the error that ended the reading.
     [[nodiscard]] std::expected<void, ProtobufError> result() const noexcept;
 
 private:
@@ -64,8 +64,7 @@ private:
     std::optional<ProtobufError> error_;
 };
 
-// What nearly every field is made of stands here, so that a reading loop becomes one piece of code: that takes half
-// the time.
+// The steps for nearly every field are inline, so that the compiler makes one loop of them: that takes half the time.
 
 template <typename Integer> bool ProtobufReader::takeVarint(Integer& value) noexcept
 {

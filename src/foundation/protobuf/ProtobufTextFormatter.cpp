@@ -1,4 +1,4 @@
-// Text is escaped so that the protocol's own parser reads back the bytes that there were.
+// Text is escaped so that the protocol's own parser reads back the same bytes.
 #include "foundation/protobuf/ProtobufTextFormatter.h"
 
 #include "foundation/text/Format.h"
@@ -20,7 +20,7 @@ void appendEscaped(std::string_view text, std::string& out)
         else if (byte >= 0x20 && byte < 0x7F)
             out.push_back(character);
         else
-            format_to(std::back_inserter(out), "\\{:03o}", byte); // always three digits: one that follows is text
+            format_to(std::back_inserter(out), "\\{:03o}", byte); // always three digits: a digit may follow
     }
 }
 

@@ -18,7 +18,7 @@ public:
     void endObject(); // the one begun last
 
     void format(std::string_view name, std::uint64_t value);
-    // In quotation marks; whatever is not a printable character of ASCII becomes an escape.
+    // In quotation marks; characters that are not printable ASCII become escapes.
     void format(std::string_view name, std::string_view text);
 
 private:

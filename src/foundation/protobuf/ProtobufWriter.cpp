@@ -1,4 +1,4 @@
-// A field is its tag, its value, and nothing between: each is put in place by one step on the string.
+// A field is its tag and then its value: the writer appends both in one step on the string.
 #include "foundation/protobuf/ProtobufWriter.h"
 
 #include "foundation/protobuf/ProtobufReader.h"

@@ -13,7 +13,7 @@ public:
     // Appends to `out`, which outlives the writer.
     explicit ProtobufWriter(std::string& out) noexcept : out_(out) { }
 
-    // Makes room for so many bytes more, so that whoever knows roughly how long a message gets has it grow once.
+    // Makes room for so many more bytes: a caller that knows a message's rough length lets the string grow only once.
     void reserve(std::size_t additional) { out_.reserve(out_.size() + additional); }
 
     // In as few bytes as the number takes.
@@ -21,7 +21,7 @@ public:
     // Shorter than 2 GiB.
     void writeString(std::uint32_t field, std::string_view text);
 
-    // What a field takes at most beside the bytes of its text: the tag, and the longest number.
+    // The most bytes of a field besides those of its text: the tag, and the longest number.
     static constexpr std::size_t longestHead = 5 + 10;
 
 private:

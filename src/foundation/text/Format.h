@@ -1,5 +1,5 @@
-// Formatting of text. It is {fmt}, which is what std::format became; when the compilers that the project supports
-// have that, only this file changes.
+// Formatting of text. It is {fmt}, the model of std::format; when all compilers that the project supports have
+// std::format, only this file changes.
 #pragma once
 
 #include <fmt/format.h>

@@ -1,4 +1,4 @@
-// The standard library rounds the exact binary value half to even; what is left to do is to drop zeros.
+// The standard library rounds the exact binary value half to even; this file only drops zeros.
 #include "foundation/text/NumberFormatter.h"
 
 #include <algorithm>
@@ -9,7 +9,7 @@ namespace foundation {
 
 std::string formatDecimal(double number, unsigned minimumFractionDigits, unsigned maximumFractionDigits)
 {
-    // 309 digits before the point at most; a double has no more than 1,074 behind it.
+    // A double has at most 309 digits before the point and 1,074 behind it.
     constexpr unsigned mostFractionDigits = 1074;
     std::array<char, 1400> buffer;
     const unsigned digits = std::min(maximumFractionDigits, mostFractionDigits);

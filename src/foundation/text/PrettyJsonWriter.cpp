@@ -1,4 +1,4 @@
-// RapidJSON indents; the text gathers here and is passed on in large pieces.
+// RapidJSON indents; this file collects the text and passes it on in large pieces.
 #include "foundation/text/PrettyJsonWriter.h"
 
 #include "foundation/values/JsonValueWriter.h"
@@ -45,7 +45,7 @@ public:
 
     [[nodiscard]] bool isWhole() const { return isWhole_; }
 
-    // Writes with the writer, unless there is no point in it any more.
+    // Calls `write` with the writer, unless an earlier value has failed.
     template <typename Write> void write(Write write)
     {
         isWhole_ = isWhole_ && write(writer_);

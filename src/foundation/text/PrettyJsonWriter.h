@@ -26,13 +26,13 @@ public:
     void key(std::string_view key);
     void write(const Value& value);
     void write(CborItem item);
-    // A key and its value. Their text is put into `text`: it may be written instead, wherever as many objects and
-    // arrays are open.
+    // A key and its value. Puts their text into `text`, which may be written in their place wherever the same number of
+    // objects and arrays is open.
     void writeMember(std::string_view key, CborItem value, std::string& text);
     void writeMember(std::string_view text);
 
-    // False once a value held NaN or infinity, which JSON cannot say. What was written is then of no use, and nothing
-    // more is written.
+    // False after a value held NaN or infinity, which JSON cannot express. The text so far is then not usable, and the
+    // writer writes no more.
     [[nodiscard]] bool isWhole() const;
 
 private:

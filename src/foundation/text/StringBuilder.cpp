@@ -21,7 +21,7 @@ String StringBuilder::finish() &&
     return String(Reference<StringObject>::adopt(StringObject::createIn(memory_.release(), std::exchange(size_, 0))));
 }
 
-// What stands there already serves as a longer and longer pattern, up to what a processor keeps at hand.
+// The copied text serves as a longer and longer pattern, up to the size of a processor's cache.
 void StringBuilder::repeatLast(std::size_t size, std::size_t times)
 {
     constexpr std::size_t longPattern = std::size_t{16} << 10;

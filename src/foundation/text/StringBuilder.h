@@ -1,7 +1,7 @@
 // A string in the making, which may become very long.
 //
-// It is the string's own memory that grows, by `realloc`: where the text is large, the system moves its pages
-// and copies nothing, and the finished string is there once, not beside what it was made from.
+// The string's own memory grows, by `realloc`: the system moves the pages of a large text instead of copying it, and
+// there is never a second copy of the finished string.
 #pragma once
 
 #include "foundation/values/String.h"
@@ -47,7 +47,7 @@ public:
     void append(char character) { append(std::string_view(&character, 1)); }
     // Appends the last `size` characters again, so many times.
     void repeatLast(std::size_t size, std::size_t times);
-    // Takes the last character away; there is one.
+    // Removes the last character; the string must not be empty.
     void dropLast() noexcept { --size_; }
 
     // Leaves an empty builder.

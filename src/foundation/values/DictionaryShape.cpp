@@ -13,7 +13,7 @@ namespace {
 
 constexpr std::size_t fewKeys = 16;
 
-// Where there are many; empty for few.
+// The sorted positions of many keys; empty for few keys.
 std::vector<std::uint32_t> sortedPositions(std::span<const String> keys)
 {
     if (keys.size() <= fewKeys)
@@ -62,7 +62,8 @@ unsigned fingerprint(std::string_view key) noexcept
     return (static_cast<unsigned>(key.size()) + 5U * at(0) + 11U * at(key.size() / 2) + 23U * at(key.size() - 1)) % 64;
 }
 
-// By position, that of the first such key. Nearly always nothing is repeated, and the fingerprints show it.
+// For each position, the position of the first equal key. Keys hardly ever repeat, and the fingerprints show this
+// quickly.
 std::vector<std::uint32_t> firstOfFew(std::span<const String> keys)
 {
     std::vector<std::uint32_t> firsts(keys.size());
@@ -89,8 +90,8 @@ std::vector<std::uint32_t> firstOfMany(std::span<const String> keys, std::span<c
     return firsts;
 }
 
-// Moves what is distinct to the front; `firsts` is, by position, that of the first such key. Returns how many these
-// are.
+// Moves the distinct keys to the front; `firsts` has for each position that of the first equal key. Returns the number
+// of distinct keys.
 std::size_t moveToFront(std::span<std::uint32_t> firsts, std::span<String> keys, std::span<Value> values)
 {
     std::uint32_t kept = 0;

@@ -1,7 +1,7 @@
 // The keys of dictionaries, in their order: what language runtimes call a shape.
 //
-// The messages of a player have the same keys in the same order, time after time. Dictionaries that share the one
-// object for them are made, compared and let go without a look at any key.
+// The messages of a player have the same keys in the same order, time after time. Dictionaries that share one shape are
+// made, compared and released without reading any key.
 #pragma once
 
 #include "foundation/values/Reference.h"
@@ -23,13 +23,13 @@ class DictionaryShape : public ReferenceCounted {
 public:
     // The keys are distinct.
     [[nodiscard]] static Reference<DictionaryShape> make(std::vector<String> keys);
-    // Of keys that may repeat, at least one, and a value for each: a later value of a key replaces its first one. As
-    // many of the values stay, in front, as there are distinct keys.
+    // Makes a shape of at least one key, with a value for each; keys may repeat. The last value of a key takes the
+    // place of its first. Afterwards the first values belong to the distinct keys, in their order.
     [[nodiscard]] static Reference<DictionaryShape> fold(std::vector<String> keys, std::span<Value>& values);
     static void destroy(const DictionaryShape* shape) noexcept { delete shape; }
 
     [[nodiscard]] std::span<const String> keys() const noexcept { return keys_; }
-    // So few keys, so short, that one may be remembered for whoever comes, without thinking of memory.
+    // Whether its keys are so few and short that a decoder may remember the shape at negligible memory.
     [[nodiscard]] bool isSmall() const noexcept;
     [[nodiscard]] std::optional<std::size_t> positionOf(std::string_view key) const noexcept;
 
@@ -41,8 +41,8 @@ private:
     }
 
     const std::vector<String> keys_;
-    // Where there are many, their positions in the order of their characters. Sorted rather than hashed: no choice of
-    // keys, however hostile, makes it slow.
+    // For many keys, their positions in the order of their characters. Sorted and not hashed, so that hostile keys
+    // cannot make it slow.
     const std::vector<std::uint32_t> sorted_;
 };
 

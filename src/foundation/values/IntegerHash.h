@@ -1,8 +1,6 @@
-// A hash of integers that others choose, such as IDs.
-//
-// The standard one is the number itself, so that whoever chooses the numbers can have all of them in one bucket, and
-// every look-up as slow as a list. This one mixes them with a number that is drawn when the process starts, which no
-// client can know.
+// A hash of integers that clients choose, such as IDs. The standard hash is the number itself, so a client could choose
+// numbers that fall into one bucket, and every look-up would be as slow as in a list. This hash mixes them with a
+// number that the process draws at its start, which no client can know.
 #pragma once
 
 #include <cstddef>

@@ -1,8 +1,8 @@
 // How values become JSON, for the writers of this folder: RapidJSON escapes text and keeps commas and indents,
 // numbers come from `Number`, data and dates from `Value`.
 //
-// RapidJSON takes character by character; numbers and texts that need no escapes, which is nearly all, are
-// appended whole: that takes a third of the time.
+// RapidJSON appends character by character; numbers and texts without escapes, which are nearly all, are appended
+// whole: that takes a third of the time.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -16,14 +16,14 @@
 
 namespace foundation {
 
-// What RapidJSON writes to.
+// The stream to which RapidJSON writes.
 struct JsonStringStream {
     using Ch = char;
     std::string& out;
     void Put(char character) { out.push_back(character); }
     static void Flush() { }
 };
-// RapidJSON finds it for its indents.
+// RapidJSON calls it for its indents.
 inline void PutN(JsonStringStream& stream, char character, std::size_t count)
 {
     stream.out.append(count, character);
@@ -72,7 +72,7 @@ public:
     bool writeMember(std::string_view text)
     {
         prefix(rapidjson::kStringType);
-        ++this->level_stack_.template Top<typename RapidWriter::Level>()->valueCount; // which the text holds too
+        ++this->level_stack_.template Top<typename RapidWriter::Level>()->valueCount; // the text is a whole member
         stream_.out.append(text);
         return this->EndValue(true);
     }

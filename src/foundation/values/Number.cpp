@@ -1,5 +1,5 @@
-// What a number is worth: conversions that never leave the range of their result, and equality that is exact,
-// so that no integer is compared by way of a double that cannot hold it.
+// Conversions that never leave the range of their result, and exact equality, which does not compare an integer by way
+// of a double that cannot hold it.
 #include "foundation/values/Number.h"
 
 #include <cmath>

@@ -1,8 +1,7 @@
-// A number that remembers what kind of number it was, and compares by what it is worth.
+// A number that keeps its kind, and compares by its value.
 //
-// Clients send booleans, integers and floats of two widths. The kind decides how a number is
-// written; the value alone decides whether two numbers are equal, so that a client which sends 1 where
-// it sent true before has not said anything new.
+// Clients send booleans, integers and floats of two widths. The kind decides how a number is written; the value alone
+// decides whether two numbers are equal, so that a client which sends first true and then 1 repeats itself.
 #pragma once
 
 #include <array>
@@ -35,7 +34,7 @@ public:
 
     // False for zero, true for everything else (NaN too).
     [[nodiscard]] bool booleanValue() const noexcept;
-    // Cut towards zero; what is out of range becomes the nearest end, NaN becomes 0.
+    // Cut towards zero; a number out of range becomes the nearest end of the range, NaN becomes 0.
     [[nodiscard]] std::int64_t int64Value() const noexcept;
     [[nodiscard]] double doubleValue() const noexcept;
 
@@ -45,18 +44,18 @@ public:
     // Integers in decimal, booleans 1 and 0, floats the shortest decimal that reads back to the same
     // value of their kind.
     [[nodiscard]] std::string text() const;
-    // To whatever appends characters.
+    // Appends the text to `out`.
     template <typename Out> void appendText(Out& out) const;
 
     // Equal when the two stand for exactly the same number: true, 1 and 1.0 are equal, 2^53 + 1 and
-    // the double 2^53 are not, NaN equals nothing.
+    // the double 2^53 are not, and NaN does not equal anything.
     friend bool operator==(const Number& left, const Number& right) noexcept;
 
 private:
     friend class Value;
 
     static constexpr std::size_t longestText = 32;
-    // Writes the text to `out`, where there is room for the longest, and returns its end.
+    // Writes the text to `out`, which has room for the longest text, and returns its end.
     char* writeText(char* out) const;
 
     constexpr Number(Kind kind, std::uint64_t bits) noexcept : kind_(kind), bits_(bits) { }

@@ -1,8 +1,8 @@
 // Shared ownership of immutable objects, one pointer wide.
 //
 // Strings, arrays and dictionaries are shared by every value that holds them: copying a value is
-// one atomic increment. `std::shared_ptr` would be two pointers wide and twice the allocation, and
-// values are what the service moves most.
+// one atomic increment. `std::shared_ptr` would be two pointers wide with a second allocation, and the service copies
+// nothing as often as values.
 #pragma once
 
 #include <atomic>
@@ -20,7 +20,7 @@ public:
 
     void retain() const noexcept { owners_.fetch_add(1, std::memory_order_relaxed); }
 
-    // True when the last owner let go and the object must be destroyed.
+    // True if this was the last owner, and the object must be destroyed.
     [[nodiscard]] bool release() const noexcept { return owners_.fetch_sub(1, std::memory_order_acq_rel) == 1; }
 
 private:
@@ -32,7 +32,7 @@ template <typename Object> class Reference {
 public:
     constexpr Reference() noexcept = default;
 
-    // Takes over the owner that a new object starts with; or nothing, given null.
+    // Takes over the first owner of a new object; null gives an empty reference.
     static Reference adopt(const Object* object) noexcept
     {
         Reference reference;
@@ -62,7 +62,7 @@ public:
     const Object* operator->() const noexcept { return object_; }
     explicit operator bool() const noexcept { return object_ != nullptr; }
 
-    // Hands the owner out; whoever takes it must `adopt` it again.
+    // Gives up the ownership; the caller must `adopt` the object again.
     [[nodiscard]] const Object* leak() noexcept { return std::exchange(object_, nullptr); }
 
 private:

@@ -68,7 +68,7 @@ bool isValidUtf8(std::string_view bytes) noexcept
     while (!bytes.empty()) {
         if (std::uint64_t word = 0; bytes.size() >= sizeof word) {
             std::memcpy(&word, bytes.data(), sizeof word);
-            if ((word & highBits) == 0) { // eight ASCII characters at once: nearly all text is that
+            if ((word & highBits) == 0) { // eight ASCII characters at once: nearly all text is ASCII
                 bytes.remove_prefix(sizeof word);
                 continue;
             }

@@ -1,8 +1,7 @@
-// Immutable shared text, and data, which is the same without the promise of being text.
+// Immutable shared text; and data, whose bytes need not be text.
 //
-// A string has an identity beside its characters: a copy is the same object, a string made anew from
-// equal characters is not. The service has one constant that only in-process code can hand in, and
-// tells it by that.
+// A string has an identity besides its characters: a copy is the same object, a string made anew from equal characters
+// is not. By this identity the service recognises one constant that only code of this process can pass.
 #pragma once
 
 #include "foundation/values/Reference.h"
@@ -15,12 +14,12 @@
 
 namespace foundation {
 
-// The characters behind a `String`: length and bytes in one allocation, of `malloc`, so that a `StringBuilder` can
-// have it grown in place.
+// The characters behind a `String`: length and bytes in one allocation, from `malloc`, so that a `StringBuilder` can
+// let it grow in place.
 class StringObject : public ReferenceCounted {
 public:
     static const StringObject* create(std::string_view text);
-    // Makes memory into an object; the bytes stand there already, behind room for the object.
+    // Makes an object in this memory; the bytes are already in it, behind the room for the object.
     static const StringObject* createIn(void* memory, std::size_t size) noexcept
     {
         return new (memory) StringObject(size);
@@ -39,7 +38,7 @@ private:
     std::size_t size_;
 };
 
-// UTF-8 text. Whoever makes one from foreign bytes validates them first (`isValidUtf8`). Any thread.
+// UTF-8 text. Code that makes a string from foreign bytes validates them first (`isValidUtf8`). Any thread.
 class String {
 public:
     String() noexcept = default; // the empty string
@@ -67,7 +66,7 @@ private:
     Reference<StringObject> object_;
 };
 
-// The text up to so many bytes, and no part of a character.
+// The beginning of the text, up to so many bytes, that does not end inside a character.
 [[nodiscard]] std::string_view cutBetweenCharacters(std::string_view text, std::size_t longest) noexcept;
 
 // Whether the bytes are well-formed UTF-8 (RFC 3629: no overlong forms, no surrogates, nothing above

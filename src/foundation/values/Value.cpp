@@ -1,4 +1,4 @@
-// How values are shared, found, compared and read as something else.
+// How values are shared, found, compared and converted.
 //
 // Empty strings, arrays and dictionaries have no object: a frame of a million empty arrays, which a hostile
 // client sends in a megabyte, costs no allocation an element.
@@ -117,7 +117,7 @@ void Value::appendText(std::string& out) const
 }
 
 namespace {
-constexpr std::size_t bytesOfAnObject = 48; // what a shared object takes beside its content
+constexpr std::size_t bytesOfAnObject = 48; // memory of a shared object besides its content
 }
 
 std::size_t Value::roughBytes() const noexcept
@@ -161,7 +161,7 @@ bool operator==(const Value& left, const Value& right) noexcept
 
 namespace {
 
-// Memory for the object, with the values moved to where they stand behind it.
+// Allocates memory for the object and moves the values to their place behind it.
 template <typename Object> void* allocateWith(std::span<Value> values)
 {
     static_assert(sizeof(Object) % alignof(Value) == 0);
@@ -270,7 +270,7 @@ Dictionary Dictionary::mergedWith(const Dictionary& other) const
     return all;
 }
 
-// As long as both have the same keys in the same places, only what differs is asked whether it counts.
+// If both have the same keys in the same places, only entries that differ are checked against the ignored keys.
 bool Dictionary::isEqualIgnoring(const Dictionary& other, std::span<const std::string_view> ignored) const noexcept
 {
     const auto counts = [ignored](const String& key) {

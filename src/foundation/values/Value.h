@@ -82,7 +82,7 @@ public:
     [[nodiscard]] Kind kind() const noexcept { return kind_; }
     [[nodiscard]] bool isNull() const noexcept { return kind_ == Kind::Null; }
 
-    // The value as that type, or nothing when it is of another kind.
+    // The value as that type, or nothing if it has another kind.
     [[nodiscard]] std::optional<Number> number() const noexcept;
     [[nodiscard]] std::optional<String> string() const noexcept;
     [[nodiscard]] std::optional<Array> array() const noexcept;
@@ -90,7 +90,7 @@ public:
     [[nodiscard]] std::optional<Data> data() const noexcept;
     [[nodiscard]] std::optional<Date> date() const noexcept;
 
-    // The number as an integer of that type, or nothing when it is of no integer kind or out of range.
+    // The number as an integer of that type, or nothing if it does not have an integer kind or is out of range.
     template <std::integral Integer> [[nodiscard]] std::optional<Integer> exactly() const noexcept
     {
         return kind_ == Kind::Number ? numberUnchecked().exactly<Integer>() : std::nullopt;
@@ -102,8 +102,7 @@ public:
         return kind_ == Kind::String ? bytesUnchecked() : std::string_view();
     }
 
-    // What the value counts as where a number is asked for: text is read as its leading number, anything
-    // that is neither number nor text as 0.
+    // The value as a number: text counts as its leading number, and a value that is neither number nor text as 0.
     [[nodiscard]] double asDouble() const noexcept;
     // As a truth value: a number that is not 0, or text that begins with Y, y, T, t or a number that is not
     // 0 (after blanks, a sign and zeros); anything else is false.
@@ -114,10 +113,10 @@ public:
     [[nodiscard]] std::string text() const;
     void appendText(std::string& out) const;
 
-    // How much memory it takes, roughly, for those who bound that; what it shares with others counts in full.
+    // Roughly how much memory it takes, for bounds; shared parts count in full.
     [[nodiscard]] std::size_t roughBytes() const noexcept;
 
-    // By content; numbers by value, whatever their kinds.
+    // By content; numbers by value, for all kinds.
     friend bool operator==(const Value& left, const Value& right) noexcept;
 
 private:
@@ -213,13 +212,13 @@ private:
 
 // An immutable, shared dictionary in the order of insertion. Any thread.
 //
-// Made from a list of entries, in which one whose key stands earlier replaces that entry's value in its place; or from
-// keys or a shape that are there already. Changing is making a new one; many entries are gathered in a vector.
+// Made from a list of entries, in which the last value of a repeated key takes the place of its first; or from existing
+// keys or an existing shape. To change a dictionary, make a new one; to add many entries, collect them in a vector.
 class Dictionary {
 public:
     using Entries = std::vector<DictionaryEntry>;
 
-    // An entry, for whoever goes over a dictionary.
+    // An entry, for iteration over a dictionary.
     struct Entry {
         const String& key;
         const Value& value;
@@ -232,15 +231,15 @@ public:
     Dictionary() noexcept = default;
     Dictionary(Entries entries);
     Dictionary(std::initializer_list<DictionaryEntry> entries) : Dictionary(Entries(entries)) { }
-    // Of keys, which may repeat, and as many values, which are moved.
+    // From keys, which may repeat, and as many values, which are moved.
     Dictionary(std::vector<String> keys, std::span<Value> values);
-    // Of a shape, and a value for each of its keys; they are moved.
+    // From a shape and a value for each of its keys; the values are moved.
     Dictionary(Reference<DictionaryShape> shape, std::span<Value> values)
         : object_(Reference<DictionaryObject>::adopt(DictionaryObject::create(std::move(shape), values)))
     {
     }
 
-    // Of all dictionaries but the empty one, which has none.
+    // The shape; null for the empty dictionary.
     [[nodiscard]] Reference<DictionaryShape> shape() const noexcept
     {
         return object_ ? object_->shape() : Reference<DictionaryShape>();
@@ -263,20 +262,20 @@ public:
     [[nodiscard]] const Value* find(std::string_view key) const noexcept;
     [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
 
-    // Copies with one entry set, with one entry removed, and with all entries of another set.
+    // Copies with one entry set, with one entry removed, and with all entries of another dictionary set.
     [[nodiscard]] Dictionary with(String key, Value value) const;
     [[nodiscard]] Dictionary without(std::string_view key) const;
     [[nodiscard]] Dictionary mergedWith(const Dictionary& other) const;
 
-    // As of a value.
+    // As `Value::roughBytes`.
     [[nodiscard]] std::size_t roughBytes() const noexcept;
 
-    // Whether both are one object. They are equal then but for what is no number, which equals nothing.
+    // Whether both are one object. They are then equal, unless they hold NaN, which does not equal itself.
     [[nodiscard]] bool isSameObject(const Dictionary& other) const noexcept
     {
         return object_.get() == other.object_.get();
     }
-    // Equal but for the entries under these keys, which count on neither side.
+    // Equal if the entries under these keys are ignored on both sides.
     [[nodiscard]] bool isEqualIgnoring(const Dictionary& other, std::span<const std::string_view> keys) const noexcept;
 
     // The same keys with equal values, in any order.
@@ -329,7 +328,7 @@ inline Dictionary::Iterator Dictionary::end() const noexcept
     return {keys().data() + size(), values().data() + size()};
 }
 
-// --- What is as short as that is to cost no call.
+// --- Short functions, inline so that they cost no call.
 
 inline Value::Value(String text) noexcept : kind_(Kind::String), object_(text.object_.leak()) { }
 inline Value::Value(Array array) noexcept : kind_(Kind::Array), object_(array.object_.leak()) { }

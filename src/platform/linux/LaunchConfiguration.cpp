@@ -1,5 +1,4 @@
-// Each variable is read to the end whatever came before, and the first problem is kept: so the checks read as a
-// list.
+// Every variable is read, even after a problem, and the first problem is kept: so the checks read as a list.
 #include "platform/linux/LaunchConfiguration.h"
 
 #include <cerrno>
@@ -16,21 +15,21 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// Set but empty counts as not set, as in a unit file that takes a setting back.
+// An empty variable counts as not set, as in a unit file that resets a setting.
 std::string_view variable(const char* name)
 {
     const char* value = std::getenv(name);
     return value == nullptr ? std::string_view() : value;
 }
 
-// The first of the directories that the variable names; systemd passes several when a unit has several.
+// The first of the directories that the variable names; systemd passes all of a unit's directories.
 fs::path directoryIn(const char* name)
 {
     const std::string_view value = variable(name);
     return value.empty() ? fs::path() : fs::absolute(value.substr(0, value.find(':')));
 }
 
-// Reads one variable after the other and remembers the first thing that was wrong.
+// Reads one variable after the other and remembers the first problem.
 class EnvironmentReader {
 public:
     [[nodiscard]] const std::optional<std::string>& problem() const noexcept { return problem_; }

@@ -1,5 +1,5 @@
-// What the process was launched with: all of it environment variables, in systemd's own names where it has
-// them, so that a unit file sets everything.
+// The launch configuration of the process: environment variables, with systemd's own names where it has them, so that a
+// unit file sets everything.
 #pragma once
 
 #include "platform/linux/connection/ListeningSocket.h"
@@ -13,23 +13,23 @@
 namespace platform {
 
 struct LaunchConfiguration {
-    // The exit status of a process that cannot run with what it was given (EX_CONFIG, as systemd knows it).
+    // The exit status of a process that cannot run with its configuration (systemd's EX_CONFIG).
     static constexpr int exitStatus = 78;
 
-    // The socket that the service manager passed; it comes before `socketPath`.
+    // The socket that the service manager passed; it is used in place of `socketPath`.
     std::optional<ListeningSocket> passedSocket = {};
     std::filesystem::path socketPath = {}; // empty with a passed socket
     std::filesystem::path runtimeDirectory = {}; // may be empty with a passed socket
     std::filesystem::path stateDirectory = {};
     std::filesystem::path logsDirectory = {}; // the root of the diagnostic files
-    std::filesystem::path configurationDirectory = {}; // need not be there; what it lacks has its default
-    std::filesystem::path channelRoot = {}; // empty when neither it nor a runtime directory was given
-    std::filesystem::path soundRoot = "/proc/asound"; // what the kernel tells about sound cards; never set from outside
+    std::filesystem::path configurationDirectory = {}; // it and its files may be missing; defaults then hold
+    std::filesystem::path channelRoot = {}; // empty if neither it nor a runtime directory is set
+    std::filesystem::path soundRoot = "/proc/asound"; // the kernel's sound cards; not set from the environment
     LogThresholds logThresholds = {};
 
-    // Reads the environment and looks at the directories. The error is one line for a person: what is missing or
-    // cannot be used, and what to do. To be called once, before the first thread is started, since a passed
-    // socket is taken out of the environment.
+    // Reads the environment and checks the directories. The error is one line for a person that names what is missing
+    // or cannot be used, and what to do. Call it once, before the first thread starts, because it removes a passed
+    // socket from the environment.
     [[nodiscard]] static std::expected<LaunchConfiguration, std::string> fromEnvironment();
 };
 

@@ -1,4 +1,4 @@
-// The few ties between providers that are otherwise strangers: which preferences post which notification, and what
+// The few connections between otherwise independent providers: which preferences post which notification, and what
 // happens at the end of a turn.
 #include "platform/linux/LinuxPlatform.h"
 

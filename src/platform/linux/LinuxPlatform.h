@@ -1,4 +1,4 @@
-// All providers of this system, made in the order in which they need each other.
+// All providers of this system, made in the order of their dependencies.
 //
 //     auto launch = platform::LaunchConfiguration::fromEnvironment();
 //     if (!launch)
@@ -31,17 +31,17 @@
 
 namespace platform {
 
-// One a process, for as long as it lives: its queues run until the very end.
+// One for each process; it lives as long as the process, because its queues run until the end.
 class LinuxPlatform {
 public:
     explicit LinuxPlatform(const LaunchConfiguration& launch);
 
     [[nodiscard]] Platform platform();
-    // What the bundle does not show: how many events were kept and lost, and a way to write all that were sent.
+    // Not part of the bundle: it counts kept and lost events, and can write all sent events at once.
     [[nodiscard]] AnalyticsStore& analyticsStore() noexcept { return analytics_; }
     // For the start: see LinuxFileSystem.
     void removeUnfinished(const std::filesystem::path& folder) { fileSystem_.removeUnfinished(folder); }
-    // What the listener hands out to clients.
+    // The listener gives its descriptors to clients.
     [[nodiscard]] TraceMarkerAccess& traceMarkerAccess() noexcept { return traceMarkerAccess_; }
 
 private:
@@ -49,7 +49,7 @@ private:
     ConfigurationWatcher configurationWatcher_;
     LinuxClock clock_;
     LinuxNotifications notifications_;
-    LinuxPreferences preferences_; // tells through notifications
+    LinuxPreferences preferences_; // posts notifications
     LinuxFeatureFlags featureFlags_;
     LinuxDeviceProperties deviceProperties_;
     LinuxProcessTable processTable_;
@@ -63,7 +63,7 @@ private:
     LinuxPerformanceWriter performanceWriter_;
     LinuxMemory memory_{workQueues_};
     AnalyticsStore analytics_;
-    LinuxWorkQueues workQueues_; // ends first, for its turns end in the store
+    LinuxWorkQueues workQueues_; // destroyed first, because its turns end in the store
 };
 
 } // namespace platform

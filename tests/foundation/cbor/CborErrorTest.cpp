@@ -1,4 +1,4 @@
-// Every way in which foreign bytes can be wrong, and that none of them costs more than it says.
+// All errors of foreign bytes; none of them costs more than it may.
 #include "foundation/cbor/Cbor.h"
 
 #include "foundation/LargestAllocation.h"
@@ -71,7 +71,7 @@ TEST(CborError, TheDepthIsTheCallersToChoose)
     EXPECT_EQ(decoder.decode("\x81\x81\xA0", 2).error(), CborError::TooDeep);
 }
 
-// A million of them would overflow the stack of whoever took them one inside the other.
+// A million nested tags would overflow the stack of a recursive reader.
 TEST(CborError, TagsDoNotNest)
 {
     EXPECT_EQ(decode(std::string(1 << 20, '\xC1')).error(), CborError::Malformed);
@@ -93,7 +93,7 @@ TEST(CborError, Malformed)
     // Simple values that have a shorter head.
     for (const std::string_view hex : {"f800", "f814", "f818", "f81f"})
         expectError(hex, CborError::Malformed);
-    // Dates of something that is no number.
+    // Dates whose content is not a number.
     for (const std::string_view hex : {"c1f5", "c1f6", "c16130", "c1420000", "c180", "c1a0", "c1c100"})
         expectError(hex, CborError::Malformed);
 }
@@ -156,7 +156,7 @@ RC_GTEST_PROP(CborErrorProperty, AByteThatFollowsIsNeverOverlooked, (char follow
     RC_ASSERT(decode(encoded).error() == CborError::TrailingBytes);
 }
 
-// Not one of 2^64 claimed bytes, elements or entries is allocated before it is there.
+// None of 2^64 claimed bytes, elements or entries is allocated before it has arrived.
 TEST(CborError, AClaimOfLengthCostsNothing)
 {
     constexpr std::size_t modest = 8192;

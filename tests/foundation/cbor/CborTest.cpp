@@ -1,4 +1,4 @@
-// What is written is read back the same; and the heads that callers write by hand fit what values write.
+// Written values are read back unchanged; and heads that callers write by hand match those of values.
 #include "foundation/cbor/Cbor.h"
 
 #include "foundation/LargestAllocation.h"
@@ -43,7 +43,7 @@ RC_GTEST_PROP(CborProperty, AnythingAtAllIsReadOrRefused, (const std::string& by
     }
 }
 
-// Random bytes are seldom near to CBOR; an item with one byte changed is.
+// Random bytes are seldom close to CBOR, so this changes one byte of an item.
 RC_GTEST_PROP(CborProperty, AnItemWithOneByteChangedIsReadOrRefused, (char byte))
 {
     std::string bytes = encoded(*generated::value());
@@ -215,7 +215,7 @@ TEST(Cbor, LargeShapesAreNotRemembered)
     }
 }
 
-// What a decoder remembers makes it faster, and changes nothing.
+// The decoder's cache makes it faster and does not change the result.
 RC_GTEST_PROP(CborProperty, OneDecoderReadsWhatAFreshOneDoesEachTime, ())
 {
     CborDecoder decoder;

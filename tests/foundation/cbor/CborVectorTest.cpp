@@ -1,5 +1,5 @@
-// The examples of RFC 8949, appendix A, each of them: those that values of ours can say, in both directions;
-// those that are other spellings of them, read only; and those that must be refused.
+// All examples of RFC 8949, appendix A: those that a `Value` can express are read and written; other encodings of the
+// same values are read; the others must be refused.
 #include "foundation/cbor/Cbor.h"
 
 #include "foundation/cbor/Hex.h"

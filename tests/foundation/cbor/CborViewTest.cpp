@@ -1,4 +1,4 @@
-// What is seen in encoded values against what decoding makes of them.
+// Views of encoded values compared with decoded values.
 #include "foundation/cbor/CborView.h"
 
 #include "foundation/cbor/Cbor.h"
@@ -30,7 +30,7 @@ Value decoded(std::string_view bytes)
     return foundation::CborDecoder().decode(bytes, 100).value();
 }
 
-// Equal text tells kinds of numbers and values that equal nothing apart, too.
+// Comparing texts distinguishes the kinds of numbers, too, and works for NaN.
 void expectSame(CborItem item, const Value& value)
 {
     EXPECT_EQ(item.kind(), value.kind());
@@ -124,11 +124,11 @@ TEST(CborView, SeesStringsOfEveryWidthOfLength)
         EXPECT_EQ(CborItem::at(bytes.data()).bytes().size(), bytes.size());
         const std::string data = encoded(foundation::Data{foundation::String(text)});
         EXPECT_EQ(CborItem(data).content(), text);
-        EXPECT_EQ(CborItem(data).stringView(), "") << "which is no text";
+        EXPECT_EQ(CborItem(data).stringView(), "") << "which is not text";
     }
 }
 
-TEST(CborView, SeesNoElementsWhereThereAreNone)
+TEST(CborView, SeesNoElementsInEmptyContainers)
 {
     EXPECT_TRUE(CborItems(CborItem(encoded(Array{}))).begin() == CborItems::end());
     EXPECT_TRUE(CborItems(CborItem(encoded(Dictionary{}))).begin() == CborItems::end());

@@ -1,4 +1,4 @@
-// Another implementation as the other side: what we write, libcbor reads; what libcbor writes, we read.
+// Another implementation as the other side: libcbor reads the encoder's bytes, and the decoder reads libcbor's.
 #include "foundation/cbor/Cbor.h"
 
 #include "foundation/values/GeneratedValues.h"
@@ -127,7 +127,7 @@ RC_GTEST_PROP(CborWithLibcbor, WhatWeWriteItReads, ())
     RC_ASSERT(written(item) == ours); // libcbor keeps the width of every head
 }
 
-// It is more tolerant than we are, which is why there is no test the other way round.
+// libcbor is more tolerant than the decoder, so the opposite test would fail.
 RC_GTEST_PROP(CborWithLibcbor, WhatWeReadItReadsToo, (const std::string& bytes))
 {
     CborDecoder decoder;

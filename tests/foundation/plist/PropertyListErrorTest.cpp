@@ -1,4 +1,4 @@
-// Every way in which a property list can be wrong, what is said of it, and that none of them costs more than it may.
+// All errors of property lists and their texts; none of them costs more than it may.
 #include "foundation/plist/PropertyList.h"
 
 #include "foundation/LargestAllocation.h"
@@ -56,7 +56,7 @@ std::string repeated(std::string_view piece, std::size_t count)
 
 TEST(PropertyListErrors, NoBytes)
 {
-    expectFailure("", Malformed, "there are no bytes");
+    expectFailure("", Malformed, "the file is empty");
 }
 
 TEST(PropertyListErrors, TooManyBytesAreNotLookedAt)
@@ -71,7 +71,7 @@ TEST(PropertyListErrors, NeitherForm)
 {
     expectFailure("Children", Malformed, "line 1: text where only elements can stand");
     expectFailure("{ Children = (); }", Malformed, "line 1: text where only elements can stand");
-    expectFailure(std::string(4, '\0'), InvalidText, "the file is no text in UTF-8 or UTF-16");
+    expectFailure(std::string(4, '\0'), InvalidText, "the file is not text in UTF-8 or UTF-16");
     expectFailure("bplis", Malformed, "line 1: text where only elements can stand");
     expectFailure("bplist10" + std::string(40, '\0'), Unsupported, "header: a binary property list of another version");
 }
@@ -80,7 +80,7 @@ TEST(PropertyListErrors, NeitherForm)
 
 TEST(XmlPropertyListErrors, NotWellFormed)
 {
-    // Only the first of many is looked for from the beginning.
+    // Only the first of many failures is searched from the beginning.
     expectXmlFailure("<string>" + repeated("<a/>", 100'000) + "</string>", Malformed,
                      "an element where only text can stand");
     expectXmlFailure("<dict></array>", Malformed, "not well-formed XML: Start-end tags mismatch");
@@ -103,7 +103,7 @@ TEST(XmlPropertyListErrors, TheLineIsTheOneWhereItGoesWrong)
 
 TEST(XmlPropertyListErrors, NoPropertyList)
 {
-    expectFailure("<dict/>", Malformed, "line 1: the document is no property list");
+    expectFailure("<dict/>", Malformed, "line 1: the document is not a property list");
     expectFailure("<!-- nothing -->", Malformed, "line 1: an element is missing");
     expectFailure("<plist/>", Malformed, "line 1: an element is missing");
     expectFailure("<plist><true/><true/></plist>", Malformed, "line 1: a second element where only one can stand");
@@ -141,7 +141,7 @@ TEST(XmlPropertyListErrors, ElementsInsideOfText)
 TEST(XmlPropertyListErrors, NotUtf16)
 {
     const auto expectNoText = [](std::string_view bytes) {
-        expectFailure(bytes, InvalidText, "the file is no text in UTF-8 or UTF-16");
+        expectFailure(bytes, InvalidText, "the file is not text in UTF-8 or UTF-16");
     };
     for (const auto order : {std::endian::big, std::endian::little}) {
         const std::string list = utf16Bytes("<plist><true/></plist>", order);
@@ -154,7 +154,7 @@ TEST(XmlPropertyListErrors, NotUtf16)
     expectNoText(std::string_view("\xFF\xFE\0\0<\0\0\0", 8)); // UTF-32
 }
 
-TEST(XmlPropertyListErrors, TheLineIsToldInUtf16AsWell)
+TEST(XmlPropertyListErrors, TheLineIsReportedInUtf16AsWell)
 {
     const std::string list = "<plist>\n<dict>\n<key>a</key>\n<integer>x</integer>\n</dict>\n</plist>";
     expectFailure(utf16Bytes("\uFEFF" + list, std::endian::little), InvalidValue, "line 4: not an integer of 64 bits");
@@ -162,11 +162,11 @@ TEST(XmlPropertyListErrors, TheLineIsToldInUtf16AsWell)
 
 TEST(XmlPropertyListErrors, NotUtf8)
 {
-    expectFailure(xmlDocument("<string>\xFF</string>"), InvalidText, "the file is no text in UTF-8 or UTF-16");
-    expectFailure(xmlDocument("<string>\xED\xA0\x80</string>"), InvalidText, "the file is no text in UTF-8 or UTF-16");
+    expectFailure(xmlDocument("<string>\xFF</string>"), InvalidText, "the file is not text in UTF-8 or UTF-16");
+    expectFailure(xmlDocument("<string>\xED\xA0\x80</string>"), InvalidText, "the file is not text in UTF-8 or UTF-16");
     expectFailure(xmlDocument(std::string_view("<string>a\0b</string>", 20)), InvalidText,
-                  "the file is no text in UTF-8 or UTF-16");
-    expectFailure(xmlDocument("<true/>") + '\0', InvalidText, "the file is no text in UTF-8 or UTF-16");
+                  "the file is not text in UTF-8 or UTF-16");
+    expectFailure(xmlDocument("<true/>") + '\0', InvalidText, "the file is not text in UTF-8 or UTF-16");
 }
 
 TEST(XmlPropertyListErrors, ReferencesToNoCharacter)
@@ -177,18 +177,18 @@ TEST(XmlPropertyListErrors, ReferencesToNoCharacter)
                                              "&#X41;", "&#xD800;", "&#xDFFF;", "&#x110000;", "&#99999999999999999999;",
                                              "&#65a;"}) {
         expectXmlFailure("<string>a" + std::string(reference) + "</string>", InvalidText,
-                         "a reference to something that is no character");
+                         "a reference that is not to a character");
         expectXmlFailure("<dict><key>" + std::string(reference) + "</key><true/></dict>", InvalidText,
-                         "a reference to something that is no character");
+                         "a reference that is not to a character");
     }
 }
 
-TEST(XmlPropertyListErrors, EntitiesThatTheDocumentDefinesAreNone)
+TEST(XmlPropertyListErrors, EntitiesThatTheDocumentDefinesAreRefused)
 {
     expectFailure("<!DOCTYPE plist [<!ENTITY a \"b\">]><plist><string>&a;</string></plist>", InvalidText,
-                  "line 1: a reference to something that is no character");
+                  "line 1: a reference that is not to a character");
     expectFailure("<!DOCTYPE plist [<!ENTITY a SYSTEM \"file:///etc/passwd\">]><plist><string>&a;</string></plist>",
-                  InvalidText, "line 1: a reference to something that is no character");
+                  InvalidText, "line 1: a reference that is not to a character");
     expectFailure("<!DOCTYPE plist [<!ENTITY % a SYSTEM \"http://dtd.invalid/a\"> %a;]><plist>&a;</plist>", Malformed,
                   "line 1: text where only elements can stand");
 }
@@ -305,12 +305,12 @@ TEST(BinaryPropertyListErrors, Trailer)
 TEST(BinaryPropertyListErrors, NoSuchObject)
 {
     expectFailure(BinaryPropertyList{.objects = {"\x09"}, .top = 1}.bytes(), Malformed,
-                  "object 1: there is no such object");
+                  "object 1: this object does not exist");
     expectFailure(BinaryPropertyList{.objects = {"\x09"}, .top = ~std::uint64_t{0}}.bytes(), Malformed,
-                  "object 18446744073709551615: there is no such object");
-    expectFailure(BinaryPropertyList{}.bytes(), Malformed, "object 0: there is no such object");
+                  "object 18446744073709551615: this object does not exist");
+    expectFailure(BinaryPropertyList{}.bytes(), Malformed, "object 0: this object does not exist");
     expectFailure(BinaryPropertyList{.objects = {fromHex("a105")}}.bytes(), Malformed,
-                  "object 5: there is no such object");
+                  "object 5: this object does not exist");
 }
 
 TEST(BinaryPropertyListErrors, OffsetsOutsideOfTheObjects)
@@ -318,7 +318,7 @@ TEST(BinaryPropertyListErrors, OffsetsOutsideOfTheObjects)
     const BinaryPropertyList list{.objects = {"\x09"}};
     for (const std::uint32_t offset : {0U, 7U, 9U, 12U, 1000U, ~0U})
         expectFailure(list.header + "\x09" + bigEndian(offset, 4) + list.trailer(1, 9), Malformed,
-                      "object 0 at byte " + std::to_string(offset) + ": that is no place of objects");
+                      "object 0 at byte " + std::to_string(offset) + ": that is not a place of objects");
 }
 
 TEST(BinaryPropertyListErrors, ObjectsThatReachBeyondTheObjects)
@@ -359,10 +359,10 @@ TEST(BinaryPropertyListErrors, ObjectsThatReachBeyondTheObjects)
         expectObjectFailure(hex, Malformed, "it reaches beyond the objects");
 }
 
-TEST(BinaryPropertyListErrors, LengthsThatAreNoInteger)
+TEST(BinaryPropertyListErrors, LengthsThatAreNotIntegers)
 {
     for (const std::string_view hex : {"4f00", "4f09", "4f4161", "5f5161", "6f2200000000", "af1400", "df80", "af0f"})
-        expectObjectFailure(hex, Malformed, "its length is no integer of at most 64 bits");
+        expectObjectFailure(hex, Malformed, "its length is not an integer of at most 64 bits");
 }
 
 TEST(BinaryPropertyListErrors, KindsThatPropertyListsDoNotHave)
@@ -371,7 +371,7 @@ TEST(BinaryPropertyListErrors, KindsThatPropertyListsDoNotHave)
         expectObjectFailure(hex, Unsupported, "a kind of object that property lists do not have");
 }
 
-TEST(BinaryPropertyListErrors, ValuesThatAreNone)
+TEST(BinaryPropertyListErrors, ValuesThatAreMalformed)
 {
     expectObjectFailure("15" + std::string(64, '0'), InvalidValue, "an integer of more than 16 bytes");
     expectObjectFailure("1400000000000000010000000000000000", InvalidValue, "not an integer of 64 bits");
@@ -385,18 +385,18 @@ TEST(BinaryPropertyListErrors, ValuesThatAreNone)
     expectObjectFailure("88000000000000000000", InvalidValue, "a UID of more than 64 bits");
 }
 
-TEST(BinaryPropertyListErrors, TextThatIsNone)
+TEST(BinaryPropertyListErrors, TextThatIsNotInItsEncoding)
 {
     expectObjectFailure("52c3a9", InvalidText, "a string that is not in ASCII");
     for (const std::string_view hex : {"61d83d", "61de00", "62de00d83d", "62d83d0061", "62d83dd83d"})
         expectObjectFailure(hex, InvalidText, "a string that is not in UTF-16");
 }
 
-TEST(BinaryPropertyListErrors, KeysThatAreNoStrings)
+TEST(BinaryPropertyListErrors, KeysThatAreNotStrings)
 {
     for (const std::string_view key : {"09", "1001", "4161", "a0", "d0", "00", "8000"})
         expectFailure(BinaryPropertyList{.objects = {fromHex("d10101"), fromHex(key)}}.bytes(), Malformed,
-                      "object 0 at byte 8: a key that is no string");
+                      "object 0 at byte 8: a key that is not a string");
 }
 
 TEST(BinaryPropertyListErrors, ContainersThatContainThemselves)
@@ -483,7 +483,7 @@ TEST(BinaryPropertyListErrors, AClaimOfLengthCostsNothing)
 
 // --- any bytes
 
-RC_GTEST_PROP(PropertyListErrorProperty, WhateverIsChangedReadingEnds, ())
+RC_GTEST_PROP(PropertyListErrorProperty, ReadingEndsForAllChanges, ())
 {
     const Value value = *generated::value();
     std::string bytes = *rc::gen::arbitrary<bool>() ? binaryPropertyList(value) : xmlPropertyList(value);
@@ -494,7 +494,7 @@ RC_GTEST_PROP(PropertyListErrorProperty, WhateverIsChangedReadingEnds, ())
     RC_ASSERT(read.has_value() || saysWhy);
 }
 
-RC_GTEST_PROP(PropertyListErrorProperty, CutAtAnyByteADocumentIsNone, ())
+RC_GTEST_PROP(PropertyListErrorProperty, CutAtAnyByteADocumentIsRefused, ())
 {
     const std::string document = xmlPropertyList(*generated::value(2));
     const std::size_t whole = document.rfind('>') + 1;

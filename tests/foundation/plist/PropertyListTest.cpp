@@ -1,4 +1,4 @@
-// What property lists of both forms become.
+// The values of property lists in both forms.
 #include "foundation/plist/PropertyList.h"
 
 #include "foundation/cbor/Hex.h"
@@ -49,7 +49,7 @@ constexpr std::int64_t least = std::numeric_limits<std::int64_t>::min();
 constexpr std::int64_t most = std::numeric_limits<std::int64_t>::max();
 constexpr std::uint64_t mostUnsigned = std::numeric_limits<std::uint64_t>::max();
 
-// --- what another program wrote
+// --- files of another program
 
 // Everything that both forms have.
 Value everything()
@@ -117,7 +117,7 @@ TEST(PropertyList, ReadsABinaryOneThatAnotherProgramWrote)
 
 // --- both forms
 
-// The value with every key and everything that is no container as `change` returns it.
+// The value with `change` applied to every key and to every value that is not a container.
 template <typename Change> Value withEach(const Value& value, Change change)
 {
     if (const auto array = value.array()) {
@@ -231,7 +231,7 @@ TEST(XmlPropertyList, Dates)
     EXPECT_EQ(date(" 2024-02-29T23:59:59Z\n"), 1709251199);
     EXPECT_EQ(date("0001-01-01T00:00:00Z"), -62135596800);
     EXPECT_EQ(date("9999-12-31T23:59:59Z"), 253402300799);
-    // What is missing from the end on is the least that it can be.
+    // Missing last parts have their least value.
     EXPECT_EQ(date("2001-01-01T01:01Z"), 978307200 + 3660);
     EXPECT_EQ(date("2001-01-01T01Z"), 978307200 + 3600);
     EXPECT_EQ(date("2001-01-02Z"), 978307200 + 86400);

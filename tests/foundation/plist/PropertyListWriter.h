@@ -1,5 +1,5 @@
-// Property lists in both forms as other programs write them, for tests of who reads them; and binary ones that no
-// program would write, made of parts that are given byte for byte.
+// Writes property lists in both forms as other programs do, for tests of the readers; and malformed binary ones, from
+// parts that are given byte for byte.
 #pragma once
 
 #include "foundation/values/Value.h"

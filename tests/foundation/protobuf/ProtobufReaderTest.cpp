@@ -1,4 +1,4 @@
-// The wire format by hand: every wire type, every way in which bytes can be wrong, and nothing read beyond the last.
+// The wire format by hand: every wire type, all errors, and no reading beyond the last byte.
 #include "foundation/protobuf/ProtobufReader.h"
 
 #include "foundation/GuardedBytes.h"
@@ -30,7 +30,7 @@ struct Read {
     std::optional<ProtobufError> error;
 };
 
-// All fields; their bytes are gone with the guard, so only what compares without them may be looked at.
+// All fields; their bytes become invalid with the guard, so a test may only use members that do not need them.
 Read readAll(std::string_view bytes)
 {
     ProtobufReader reader(bytes);

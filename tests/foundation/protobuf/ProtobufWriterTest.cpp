@@ -1,4 +1,4 @@
-// What is written, byte by byte, and as text.
+// The written bytes, and the text.
 #include "foundation/protobuf/ProtobufWriter.h"
 #include "foundation/protobuf/ProtobufTextFormatter.h"
 

@@ -50,20 +50,20 @@ TEST(NumberFormatter, HoldsTheLongestNumbersThereAre)
     EXPECT_EQ(formatDecimal(std::numeric_limits<double>::denorm_min(), 0, 4'000'000'000).size(), 2 + 1074U);
 }
 
-TEST(NumberFormatter, WhatIsNoNumberIsAWord)
+TEST(NumberFormatter, NaNIsAWord)
 {
     EXPECT_EQ(formatDecimal(std::numeric_limits<double>::infinity(), 1, 2), "inf");
     EXPECT_EQ(formatDecimal(std::numeric_limits<double>::quiet_NaN(), 1, 2), "nan");
 }
 
-// As in much of Europe, made here so that none need be installed.
+// A decimal comma, as in much of Europe; the test makes the locale so that it need not be installed.
 class CommaPunctuation : public std::numpunct<char> {
     [[nodiscard]] char do_decimal_point() const override { return ','; }
     [[nodiscard]] char do_thousands_sep() const override { return '.'; }
     [[nodiscard]] std::string do_grouping() const override { return "\3"; }
 };
 
-TEST(NumberFormatter, WritesAPointWhateverTheLocale)
+TEST(NumberFormatter, WritesAPointInEveryLocale)
 {
     const std::locale before = std::locale::global(std::locale(std::locale(), new CommaPunctuation));
     const std::string text = formatDecimal(12345.25, 1, 2);

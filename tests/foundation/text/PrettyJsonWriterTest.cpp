@@ -24,7 +24,7 @@ using foundation::Value;
 
 constexpr double nan = std::numeric_limits<double>::quiet_NaN();
 
-// What was written, piece by piece.
+// The written pieces.
 class Pieces {
 public:
     [[nodiscard]] PrettyJsonWriter::Sink sink()
@@ -58,7 +58,7 @@ std::string pretty(const Value& value)
     return pieces.text();
 }
 
-// The same in RapidJSON's own hands, from reading to writing.
+// The same with RapidJSON alone, from reading to writing.
 std::string rapidJsonPretty(const std::string& compact)
 {
     rapidjson::MemoryStream stream(compact.data(), compact.size());
@@ -68,7 +68,7 @@ std::string rapidJsonPretty(const std::string& compact)
     return {buffer.GetString(), buffer.GetSize()};
 }
 
-// Texts instead of numbers, whose writing is ours and not RapidJSON's.
+// Texts instead of numbers, because the writer formats numbers itself.
 Value withNumbersAsTexts(const Value& value)
 {
     if (const auto number = value.number())

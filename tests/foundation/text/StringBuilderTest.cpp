@@ -1,5 +1,4 @@
-// Text that grows piece by piece: held against plain concatenation, at its beginning, its end and everywhere memory is
-// asked for anew.
+// Text that grows piece by piece, compared with plain concatenation, also where memory is reallocated.
 #include "foundation/text/StringBuilder.h"
 
 #include "foundation/values/Value.h"

@@ -1,4 +1,4 @@
-// Dictionaries against the plainest formulation of what they are: a list of pairs that is searched from the front.
+// Dictionaries compared with their simplest formulation: a list of pairs that is searched from the front.
 #include "foundation/values/GeneratedValues.h"
 #include "foundation/values/Value.h"
 
@@ -128,7 +128,7 @@ RC_GTEST_PROP(DictionaryProperty, FoldsRepeatedKeysAsAWalkWould, ())
         RC_ASSERT(*dictionary.find(entry.key) == entry.value);
 }
 
-TEST(Dictionary, DoesNotEqualItselfWhenItHoldsWhatIsNoNumber)
+TEST(Dictionary, DoesNotEqualItselfWhenItHoldsNaN)
 {
     const Dictionary dictionary{{"a", std::numeric_limits<double>::quiet_NaN()}};
     EXPECT_NE(dictionary, dictionary);

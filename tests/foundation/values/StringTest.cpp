@@ -1,4 +1,4 @@
-// The identity of strings, and the table of what is UTF-8.
+// The identity of strings, and the table of UTF-8.
 #include "foundation/values/String.h"
 
 #include <array>
@@ -12,7 +12,7 @@ namespace {
 
 using namespace std::string_view_literals;
 
-TEST(String, HoldsItsCharactersWhateverTheyAre)
+TEST(String, HoldsAnyCharacters)
 {
     EXPECT_EQ(String("Playback").view(), "Playback");
     EXPECT_EQ(String("a\0b"sv).view(), "a\0b"sv);
@@ -116,7 +116,7 @@ TEST(Utf8, TheTable)
         EXPECT_EQ(isValidUtf8(given.bytes), given.valid) << given.why;
 }
 
-// Text is checked eight characters at a time, so what is wrong must be found wherever it stands.
+// Text is checked eight characters at a time, so an error must be found at every position.
 TEST(Utf8, TheTableAtEveryPlaceInALongerText)
 {
     for (const Utf8Case& given : utf8Cases)

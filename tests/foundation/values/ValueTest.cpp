@@ -1,4 +1,4 @@
-// What a value is, counts as and reads as, and that copies share instead of copying.
+// The kinds of values, their conversions, and the sharing of copies.
 #include "foundation/values/Value.h"
 
 #include "foundation/values/GeneratedValues.h"
@@ -85,7 +85,7 @@ TEST(Value, AssignmentReplacesAndSurvivesItself)
     const Value& alias = value;
     value = alias;
     EXPECT_EQ(value, Value(Array{"a"}));
-    value = value.array()->values()[0]; // what it is made from goes with what it was
+    value = value.array()->values()[0]; // the new value is a part of the old one, which goes
     EXPECT_EQ(value, Value("a"));
 }
 

@@ -1,5 +1,5 @@
-// The contract of platform/Analytics.h: events whose names somebody wants are kept, in order, with payloads that are
-// built once; of the others nothing remains.
+// The contract of platform/Analytics.h: wanted events are kept, in order, with payloads that are built once; other
+// events are dropped completely.
 #include "platform/contract/Contract.h"
 #include "platform/linux/process/LinuxClock.h"
 #include "platform/linux/store/AnalyticsStore.h"
@@ -30,8 +30,7 @@ class AnalyticsSubject {
 public:
     virtual ~AnalyticsSubject() = default;
     [[nodiscard]] virtual platform::Analytics& analytics() = 0;
-    // From now on some consumer wants events of such names, which are globs; nobody wants any at first. It takes effect
-    // a moment later.
+    // From now on events whose names match the globs are wanted; at first none are. It takes effect a moment later.
     virtual void use(const std::string& pattern) = 0;
     // What the platform does when a turn is over.
     virtual void end(platform::Turn&) { }
@@ -145,7 +144,7 @@ KESTO_CONTRACT(AnalyticsContract, (provider<AnalyticsSubject, FakeAnalyticsSubje
                (provider<AnalyticsSubject, LinuxAnalyticsSubject>("Linux")),
                (provider<AnalyticsSubject, MemoryAnalyticsSubject>("LinuxInMemory")));
 
-TEST_P(AnalyticsContract, WantsEventsOfTheNamesThatSomebodyUses)
+TEST_P(AnalyticsContract, WantsEventsOfTheUsedNames)
 {
     EXPECT_FALSE(subject->analytics().isAnalyticsEventUsed("com.quarn.a"));
     want("com.quarn.a");
@@ -202,7 +201,7 @@ TEST_P(AnalyticsContract, BuildsAPayloadOnceAndLetsItsBuilderGo)
     EXPECT_TRUE(watched.expired());
 }
 
-TEST_P(AnalyticsContract, DropsAnEventThatNobodyWantsWithItsBuilder)
+TEST_P(AnalyticsContract, DropsAnUnwantedEventWithItsBuilder)
 {
     want("com.quarn.a");
     auto held = std::make_shared<int>(7);
@@ -214,7 +213,7 @@ TEST_P(AnalyticsContract, DropsAnEventThatNobodyWantsWithItsBuilder)
     EXPECT_TRUE(watched.expired());
     subject->use("com.quarn.*");
     ASSERT_TRUE(eventually([&] { return subject->analytics().isAnalyticsEventUsed("com.quarn.b"); }));
-    EXPECT_THAT(subject->events(), IsEmpty()) << "also when somebody wants such events later";
+    EXPECT_THAT(subject->events(), IsEmpty()) << "also when such events are wanted later";
 }
 
 TEST_P(AnalyticsContract, LosesAnEventWhosePayloadHoldsANumberThatIsNotFinite)

@@ -21,11 +21,11 @@ using platform::BugCaptureReporter;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// What is kept of one request.
+// The kept data of one request.
 struct Kept {
     Dictionary signature;
     double duration;
-    Value event; // null: there was none, as in what follows
+    Value event; // null if it was missing; the same holds below
     Value payload;
     Value state;
     friend bool operator==(const Kept&, const Kept&) = default;
@@ -35,7 +35,7 @@ class BugCaptureSubject {
 public:
     virtual ~BugCaptureSubject() = default;
     [[nodiscard]] virtual platform::BugCapture& capture() = 0;
-    // Answers what was asked so far.
+    // Answers all requests so far.
     virtual void work() = 0;
     // The snapshots that were taken, in order.
     [[nodiscard]] virtual std::vector<Kept> kept() = 0;
@@ -47,7 +47,7 @@ public:
     void work() override
     {
         while (answered_ < capture_.snapshots().size()) {
-            auto reply = std::move(capture_.snapshots()[answered_++].reply); // which may ask for more of them
+            auto reply = std::move(capture_.snapshots()[answered_++].reply); // the reply may request more snapshots
             reply({{"success", true}});
         }
     }
@@ -105,7 +105,7 @@ protected:
         return subject->capture().makeReporter()->makeSignature("Sonalis", "haptics", "Playback", "Gimbo", "player",
                                                                 triggerThresholdValues);
     }
-    // Asks for a snapshot with a reporter of its own, which is gone at once.
+    // Requests a snapshot with a reporter of its own, which is destroyed at once.
     void request(int number)
     {
         subject->capture().makeReporter()->requestSnapshot(signature(), 0, std::nullopt, std::nullopt,

@@ -1,5 +1,5 @@
-// The contract of platform/Connection.h: the order of calls and ends, who is held until when, when answers leave, and
-// what becomes of those that come too late.
+// The contract of platform/Connection.h: the order of calls and ends, the lifetimes of handlers and callers, when
+// answers leave, and late answers.
 #include "platform/contract/Contract.h"
 #include "platform/linux/connection/ConnectionClient.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
@@ -212,7 +212,7 @@ struct Record {
     std::vector<Connection::Call> calls; // not answered yet
     std::vector<std::string> history; // "call 1", "interrupted", "invalidated"
     std::set<std::thread::id> threads; // on which it happened
-    // What the handlers hold, each for itself.
+    // The objects that the handlers hold, one for each.
     std::weak_ptr<int> callHandler;
     std::weak_ptr<int> interruptionHandler;
     std::weak_ptr<int> invalidationHandler;
@@ -255,11 +255,11 @@ public:
 protected:
     using Outcome = std::expected<void, Connection::Violation>;
 
-    void TearDown() override { subject->stop(); } // while all of the test is there still
+    void TearDown() override { subject->stop(); } // while the test's objects still exist
 
     void listen() { subject->listen(*this); }
 
-    // A peer, and what is known of its connection.
+    // A peer, and the record of its connection.
     std::pair<std::unique_ptr<Peer>, std::shared_ptr<Record>> connect()
     {
         auto peer = subject->connect();
@@ -459,7 +459,7 @@ TEST_P(ConnectionContract, IsInvalidatedOnceWhenThePeerClosesIt)
     peer->call({callOf(1)});
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
-    subject->stop(); // after which nothing can come
+    subject->stop(); // nothing can come afterwards
     EXPECT_THAT(record->history, ElementsAre("call 1", "invalidated"));
 }
 
@@ -572,7 +572,7 @@ TEST_P(ConnectionContract, LetsACallOutliveIt)
     support::sendAtOnce(*record->calls[0].caller, answer(1)); // which nobody reads
     const std::weak_ptr<Connection> connection = record->connection;
     record->connection.reset();
-    EXPECT_FALSE(connection.expired()) << "whoever works on a call has its caller";
+    EXPECT_FALSE(connection.expired()) << "code that works on a call holds its caller";
     record->calls.clear();
 }
 

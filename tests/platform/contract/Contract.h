@@ -1,9 +1,9 @@
-// What the contracts have in common. A contract is a suite of tests that is written once, against an interface of
-// src/platform, and runs on the fake and on the provider of Linux: what either does not keep is a defect of that one,
-// or of the interface's words.
+// The common part of the contracts. A contract is a suite of tests that is written once, for an interface of
+// src/platform, and runs on the fake and on the provider of Linux: a failure is a defect of that provider, or of the
+// interface's comments.
 //
-// A suite sees both as a subject, which knows how to make the service and how to bring about what comes from outside: a
-// peer that connects, a file that changes, an event of the kernel.
+// A suite uses both through a subject, which makes the service and causes events from outside: a peer that connects, a
+// file that changes, an event of the kernel.
 #pragma once
 
 #include "support/Progress.h"
@@ -36,7 +36,7 @@ protected:
     const std::unique_ptr<Subject> subject = this->GetParam().make();
 };
 
-// Until it holds, which another thread may have to bring about.
+// Waits until the condition holds; another thread may have to make it true.
 template <typename Condition> [[nodiscard]] bool eventually(Condition condition)
 {
     const auto deadline = std::chrono::steady_clock::now() + support::longestWait;
@@ -50,7 +50,7 @@ template <typename Condition> [[nodiscard]] bool eventually(Condition condition)
 
 } // namespace contract
 
-// Has the suite run on these providers: KESTO_CONTRACT(ClockContract, provider<Clock, FakeClock>("Fake"), ...)
+// Runs the suite on these providers: KESTO_CONTRACT(ClockContract, provider<Clock, FakeClock>("Fake"), ...)
 #define KESTO_CONTRACT(suite, ...)                                      \
     INSTANTIATE_TEST_SUITE_P(Both, suite, testing::Values(__VA_ARGS__), \
                              [](const auto& instance) { return std::string(instance.param.name); })

@@ -12,7 +12,7 @@ class DevicePropertiesSubject {
 public:
     virtual ~DevicePropertiesSubject() = default;
     [[nodiscard]] virtual const platform::DeviceProperties& properties() const = 0;
-    // What the device's maker does with the one property that is mentioned. It takes effect a moment later.
+    // The device's maker sets the property of the test. It takes effect a moment later.
     virtual void set(const std::string& name, bool value) = 0;
 };
 

@@ -12,7 +12,7 @@ class FeatureFlagsSubject {
 public:
     virtual ~FeatureFlagsSubject() = default;
     [[nodiscard]] virtual const platform::FeatureFlags& flags() const = 0;
-    // What the device's owner does with the one flag that is mentioned. It takes effect a moment later.
+    // The device's owner sets the flag of the test. It takes effect a moment later.
     virtual void set(const std::string& domain, const std::string& flag, bool isEnabled) = 0;
 };
 
@@ -51,7 +51,7 @@ using FeatureFlagsContract = Suite<FeatureFlagsSubject>;
 KESTO_CONTRACT(FeatureFlagsContract, (provider<FeatureFlagsSubject, FakeFeatureFlagsSubject>("Fake")),
                (provider<FeatureFlagsSubject, LinuxFeatureFlagsSubject>("Linux")));
 
-TEST_P(FeatureFlagsContract, AreOffUnlessSomebodySetThem)
+TEST_P(FeatureFlagsContract, AreOffByDefault)
 {
     EXPECT_FALSE(subject->flags().isEnabled("Sonalis", "Tracing"));
 }

@@ -1,5 +1,5 @@
-// The contract of platform/FileSystem.h: folders with their permissions, files that are there whole or not at all, and
-// what is said of those that cannot be written or read.
+// The contract of platform/FileSystem.h: folders with their permissions, files that are complete or missing, and the
+// errors of files that cannot be written or read.
 #include "platform/contract/Contract.h"
 #include "platform/linux/diagnostics/FolderKeeper.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
@@ -28,13 +28,13 @@ public:
     [[nodiscard]] virtual platform::FileSystem& files() = 0;
     // Of the folder, if there is one.
     [[nodiscard]] virtual std::optional<unsigned> permissionsOf(const fs::path& folder) = 0;
-    // The names of what stands in the folder, in order, those too that are hidden.
+    // The names in the folder, sorted, hidden ones too.
     [[nodiscard]] virtual std::vector<std::string> namesIn(const fs::path& folder) = 0;
     // The text of a file, if there is one.
     [[nodiscard]] virtual std::optional<std::string> textOf(const fs::path& file) = 0;
     // A file that another program wrote, outside of the root.
     [[nodiscard]] virtual fs::path writeElsewhere(const std::string& text) = 0;
-    // Does what is to be done in the background.
+    // Runs the background work.
     virtual void work() = 0;
 };
 
@@ -120,7 +120,7 @@ bool isNote(std::string_view name)
 
 class FileSystemContract : public Suite<FileSystemSubject> {
 protected:
-    // What became of it; success is no error.
+    // The result; on success the error is empty.
     std::error_code write(const fs::path& path, std::string_view text)
     {
         const auto file = files.createAtomically(path);
@@ -135,7 +135,7 @@ protected:
         const auto made = files.createDirectories(folder, permissions);
         return made ? std::error_code() : made.error();
     }
-    // A file, and the word that it came.
+    // Writes a file, and reports it.
     void add(const std::string& name, const KeptFiles& kept, std::size_t size = 1)
     {
         ASSERT_FALSE(write(root / name, std::string(size, 'x')));
@@ -204,7 +204,7 @@ TEST_P(FileSystemContract, TakesNoNameOfMoreThan255Bytes)
     EXPECT_EQ(subject->namesIn(root).size(), 2U);
 }
 
-// --- files in the making
+// --- unfinished files
 
 TEST_P(FileSystemContract, PutsAFileInItsPlaceWholeWhenItIsCommitted)
 {
@@ -296,7 +296,7 @@ TEST_P(FileSystemContract, KeepsAsManyBytesOfTheKindAsThereMayBe)
     EXPECT_THAT(names, Contains("note-3"));
     EXPECT_THAT(names, Not(Contains("note-1")));
     add("note-4", kept, 5000);
-    EXPECT_THAT(subject->namesIn(root), ElementsAre("note-4")) << "the newest stays, whatever its size";
+    EXPECT_THAT(subject->namesIn(root), ElementsAre("note-4")) << "the newest stays, even if it is too large";
 }
 
 TEST_P(FileSystemContract, RemovesNothingBeforeTheBackgroundGetsToIt)

@@ -1,7 +1,7 @@
-// The contract of platform/KernelTrace.h: what a session gets, when it is complete, and what is left of it then.
+// The contract of platform/KernelTrace.h: the events of a session, its completion, and its end.
 //
-// The provider of Linux is met twice: on a directory that looks like tracefs, everywhere, and on the kernel itself
-// where this machine lets a test have it.
+// The provider of Linux is tested twice: on an imitation of tracefs, everywhere, and on the kernel itself where this
+// machine allows it.
 #include "platform/contract/Contract.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/trace/DeliveredEvents.h"
@@ -28,7 +28,7 @@ using testing::IsEmpty;
 class KernelTraceSubject {
 public:
     virtual ~KernelTraceSubject() = default;
-    // Why it cannot be met here, if it cannot.
+    // The reason if it cannot be tested on this machine.
     [[nodiscard]] virtual std::optional<std::string> absence() const { return std::nullopt; }
     [[nodiscard]] virtual platform::KernelTrace& trace() = 0;
     [[nodiscard]] virtual platform::WorkQueues& queues() = 0;
@@ -36,11 +36,11 @@ public:
     virtual void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments = {}) = 0;
     // The system has no trace, from its start on.
     virtual void takeTraceAway() = 0;
-    // Sessions that were made cannot be started any more; false where that cannot be brought about.
+    // Makes existing sessions unable to start; false if the subject cannot do this.
     [[nodiscard]] virtual bool refuseToStart() = 0;
-    // So many events are lost; false where that cannot be brought about.
+    // Loses so many events; false if the subject cannot do this.
     [[nodiscard]] virtual bool lose(std::uint64_t count) = 0;
-    // Runs what waits on the queues, if nobody else does.
+    // Runs waiting items, if the queues have no threads.
     virtual void work() { }
 };
 
@@ -97,7 +97,7 @@ private:
     platform::TracefsKernelTrace trace_;
 };
 
-// So that it is there before the provider that looks for it.
+// Made before the provider that looks for it.
 struct TreeFirst {
     support::TracefsTree tree;
 };
@@ -138,7 +138,7 @@ public:
     [[nodiscard]] bool lose(std::uint64_t) override { return false; } // that would take a buffer full of them
 };
 
-// A session, and what was delivered to it.
+// A session and its delivered events.
 class Listener {
 public:
     explicit Listener(KernelTraceSubject& subject)
@@ -204,7 +204,7 @@ protected:
         if (const auto absence = subject->absence())
             GTEST_SKIP() << *absence;
     }
-    // Until whatever was under way before has come to its end.
+    // Waits until earlier work has ended.
     void settle()
     {
         Listener fence(*subject);
@@ -388,7 +388,7 @@ TEST_P(KernelTraceContract, CompletesNoSessionThatWasNeverStarted)
     listener.session->end();
     settle();
     listener.drain();
-    EXPECT_EQ(listener.completions(), 0) << "there is no queue for it";
+    EXPECT_EQ(listener.completions(), 0) << "it has no queue";
 }
 
 TEST_P(KernelTraceContract, NeverCompletesASessionThatIsDestroyedBefore)
@@ -450,7 +450,7 @@ TEST_P(KernelTraceContract, HoldsNothingOfASessionThatIsGone)
     EXPECT_TRUE(eventually([&] { return watched.expired(); }));
 }
 
-TEST_P(KernelTraceContract, SaysThatARangeOrAHandlerIsNone)
+TEST_P(KernelTraceContract, RefusesAnEmptyRangeAndAnEmptyHandler)
 {
     Listener listener(*subject);
     EXPECT_NE(listener.filter(9, 5), 0);

@@ -1,5 +1,5 @@
-// The contract of platform/Log.h, of the log itself: a threshold for each category, and lines that say what they were
-// given, from any thread.
+// The contract of platform/Log.h, of the log itself: a threshold for each category, and complete lines, from any
+// thread.
 #include "platform/contract/Contract.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/log/LinuxLog.h"
@@ -58,7 +58,7 @@ public:
         return log_.emplace(platform::LogThresholds::parse(platform::name(threshold)).value(),
                             platform::LinuxLog::Destination{.journalSocket = path_, .descriptor = -1});
     }
-    // Read by a thread of its own: the journal of a machine is never behind for long.
+    // A thread reads it, because a real journal is never behind for long.
     [[nodiscard]] std::vector<LogLine> lines(std::size_t count) override
     {
         EXPECT_TRUE(progress_.waitFor([&] { return lines_.size() >= count; }));
@@ -144,7 +144,7 @@ TEST_P(LogContract, KeepsALineWithAllThatItWasGiven)
     EXPECT_EQ(lines[2].name, "Other");
 }
 
-TEST_P(LogContract, WritesWhateverItIsGiven)
+TEST_P(LogContract, WritesEveryRecord)
 {
     platform::Log& log = subject->start(LogLevel::Error);
     log.write(record("below the threshold", LogLevel::Debug));

@@ -23,7 +23,7 @@ public:
     virtual void post(const std::string& name, std::optional<std::uint64_t> state) = 0;
     // A name that cannot be registered.
     [[nodiscard]] virtual std::string impossibleName() = 0;
-    // Runs what waits on the queues, if nobody else does.
+    // Runs waiting items, if the queues have no threads.
     virtual void work() { }
 };
 
@@ -70,14 +70,14 @@ private:
     platform::LinuxNotifications notifications_{directory_ / "notifications", watcher_, platform::ProviderLog(log_)};
 };
 
-// What a handler was told.
+// One call of a handler.
 struct Told {
     std::int32_t token;
     bool isOnItsQueue;
     std::optional<std::uint64_t> state; // read by the handler
 };
 
-// Registers a name and keeps what its handler is told, which may outlive it.
+// Registers a name and keeps the calls of its handler, which may outlive this object.
 class Listener {
 public:
     Listener(NotificationsSubject& subject, const std::string& name, const std::shared_ptr<platform::WorkQueue>& queue)
@@ -128,7 +128,7 @@ private:
 
 class NotificationsContract : public Suite<NotificationsSubject> {
 protected:
-    // Returns once every earlier post was told: they are told in order.
+    // Returns after all earlier posts were handled, because they are handled in order.
     void settle()
     {
         Listener fence(*subject, "fence", queue);
@@ -218,7 +218,7 @@ TEST_P(NotificationsContract, CarryStatesOf64Bits)
     }
 }
 
-TEST_P(NotificationsContract, HaveNoStateForATokenThatNobodyWasGiven)
+TEST_P(NotificationsContract, HaveNoStateForAnUnknownToken)
 {
     const Listener ringer(*subject, "ringer", queue);
     subject->post("ringer", 1);

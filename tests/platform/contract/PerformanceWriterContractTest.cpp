@@ -1,4 +1,4 @@
-// The contract of platform/PerformanceWriter.h: what a file holds when it is closed, and where none can be opened.
+// The contract of platform/PerformanceWriter.h: the content of a closed file, and places where opening fails.
 #include "platform/contract/Contract.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
@@ -25,7 +25,7 @@ struct Document {
     std::string project;
     std::uint32_t version = 0;
     std::vector<Measurement> measurements;
-    std::map<std::string, foundation::Value, std::less<>> remarks; // those that were given, and perhaps others
+    std::map<std::string, foundation::Value, std::less<>> remarks; // the test's, and perhaps others
 };
 
 class PerformanceWriterSubject {
@@ -180,7 +180,7 @@ TEST_P(PerformanceWriterContract, WritesSeveralFilesAtATime)
 
 TEST_P(PerformanceWriterContract, OpensNoFileWhereNoneCanBe)
 {
-    EXPECT_EQ(subject->writer().open(root / "missing/results", "p", 1), nullptr) << "there is no folder for it";
+    EXPECT_EQ(subject->writer().open(root / "missing/results", "p", 1), nullptr) << "its folder is missing";
     EXPECT_EQ(subject->writer().open("/outside/results", "p", 1), nullptr);
     ASSERT_TRUE(subject->files().createDirectories(path, 0777));
     EXPECT_EQ(open(), nullptr) << "a folder stands there";

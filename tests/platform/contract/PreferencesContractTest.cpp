@@ -25,7 +25,7 @@ class PreferencesSubject {
 public:
     virtual ~PreferencesSubject() = default;
     [[nodiscard]] virtual const platform::Preferences& preferences() const = 0;
-    // What the device's owner does. It takes effect a moment later.
+    // The device's owner changes values. It takes effect a moment later.
     virtual void set(const std::string& domain, const std::string& key, const Setting& setting) = 0;
     virtual void remove(const std::string& domain, const std::string& key) = 0;
 };
@@ -87,7 +87,7 @@ KESTO_CONTRACT(PreferencesContract, (provider<PreferencesSubject, FakePreference
 const Setting kitchen{"Kitchen", "\"Kitchen\""};
 const Setting bath{"Bath", "\"Bath\""};
 
-TEST_P(PreferencesContract, HaveNothingThatNobodyStored)
+TEST_P(PreferencesContract, HaveOnlyStoredValues)
 {
     EXPECT_EQ(value("com.quarn.kesto", "device_name"), std::nullopt);
     subject->set("com.quarn.kesto", "other", kitchen);

@@ -14,7 +14,7 @@ class ProcessTableSubject {
 public:
     virtual ~ProcessTableSubject() = default;
     [[nodiscard]] virtual platform::ProcessTable& table() = 0;
-    // A process that calls itself so; its number.
+    // Starts a process of that name; returns its number.
     [[nodiscard]] virtual std::int32_t start(const std::string& name) = 0;
     virtual void rename(std::int32_t process, const std::string& name) = 0;
     virtual void end(std::int32_t process) = 0;
@@ -56,7 +56,7 @@ private:
 
 class ProcessTableContract : public Suite<ProcessTableSubject> {
 protected:
-    // As it is now: what is remembered of the process is not asked.
+    // The present entry, without the cache.
     [[nodiscard]] std::optional<std::string> nameOf(std::int32_t process)
     {
         subject->table().forget(process);

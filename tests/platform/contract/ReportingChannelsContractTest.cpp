@@ -1,4 +1,4 @@
-// The contract of platform/ReportingChannels.h: what is found, what a sample holds, and what the difference of two is.
+// The contract of platform/ReportingChannels.h: finding channels, samples, and differences of two samples.
 #include "platform/contract/Contract.h"
 #include "platform/linux/channels/LinuxReportingChannels.h"
 #include "support/TemporaryDirectory.h"
@@ -26,7 +26,7 @@ class ReportingChannelsSubject {
 public:
     virtual ~ReportingChannelsSubject() = default;
     [[nodiscard]] virtual ReportingChannels& channels() = 0;
-    // A driver publishes the channel, or what has become of it.
+    // A driver publishes the channel, or its new values.
     virtual void publish(const ReportingChannel& channel) = 0;
     virtual void withdraw(const ReportingChannel& channel) = 0;
     // Whether channels of any group can be sampled.
@@ -197,7 +197,7 @@ TEST_P(ReportingChannelsContract, AreFoundByGroupAndSubgroupAndAnAbsentOneMeansA
     EXPECT_EQ(namesOf(std::nullopt, std::nullopt), "abc");
 }
 
-TEST_P(ReportingChannelsContract, AreASetWithoutChannelsOrNoneWhereNobodyPublishes)
+TEST_P(ReportingChannelsContract, AreASetWithoutChannelsOrNoneWithoutPublishers)
 {
     subject->publish(simple("a", 1));
     const auto found = subject->channels().copyChannelsInGroup("Rx", std::nullopt);
@@ -221,7 +221,7 @@ TEST_P(ReportingChannelsContract, AreSampledAsTheyAreAtThatMoment)
 {
     subject->publish(simple("changed", 1));
     subject->publish(simple("gone", 1));
-    const auto subscribed = subscribe("Speaker", std::nullopt); // the set that was found is gone already
+    const auto subscribed = subscribe("Speaker", std::nullopt); // the found set is already destroyed
     const auto before = sample(subscribed);
     subject->publish(simple("changed", 5));
     subject->publish(simple("new", 7));
@@ -287,7 +287,7 @@ TEST_P(ReportingChannelsContract, AnswerWithAnErrorWhileTheyCannotBeRead)
     EXPECT_THAT(valuesOf(sample(subscribed)), ElementsAre(Pair("a", 1))) << "the subscription holds";
 }
 
-// --- what a difference is
+// --- differences
 
 TEST_P(ReportingChannelsContract, DifferByWhatWasAddedAndTellOfNewChannelsAllAndOfThoseGoneNothing)
 {

@@ -1,5 +1,4 @@
-// The contract of platform/TraceMarkers.h: each marker is one event of the trace, and costs nothing where nobody
-// traces.
+// The contract of platform/TraceMarkers.h: each marker is one event of the trace, and without a trace it does nothing.
 #include "platform/contract/Contract.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/trace/TraceMarker.h"
@@ -23,7 +22,7 @@ class TraceMarkersSubject {
 public:
     virtual ~TraceMarkersSubject() = default;
     [[nodiscard]] virtual platform::TraceMarkers& markers() = 0;
-    // Whether somebody traces; nobody does at first.
+    // Whether a trace runs; at first none does.
     virtual void trace(bool isTracing) = 0;
     // The events in the trace since the last time.
     [[nodiscard]] virtual std::vector<TraceMarkerEvent> take() = 0;
@@ -93,7 +92,7 @@ TEST_P(TraceMarkersContract, CarryTheWholeCodeAndAllArguments)
     EXPECT_THAT(subject->take(), ElementsAre(TraceMarkerEvent{0xFFFFFFFF, {1, 0, 3, ~std::uint64_t{0}}}));
 }
 
-TEST_P(TraceMarkersContract, DoNothingWhereNobodyTraces)
+TEST_P(TraceMarkersContract, DoNothingWithoutATrace)
 {
     subject->markers().emit(1, {});
     subject->trace(true);

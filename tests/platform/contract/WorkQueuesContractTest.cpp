@@ -1,4 +1,4 @@
-// The contract of platform/WorkQueue.h: the order of items, who runs them when, and what waits for what.
+// The contract of platform/WorkQueue.h: the order of items, their threads, and waiting.
 #include "platform/contract/Contract.h"
 #include "platform/linux/NoThreads.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
@@ -23,7 +23,7 @@ class WorkQueuesSubject {
 public:
     virtual ~WorkQueuesSubject() = default;
     [[nodiscard]] virtual platform::WorkQueues& queues() = 0;
-    // Runs what waits on the queues, if nobody else does.
+    // Runs waiting items, if the queues have no threads.
     virtual void work() { }
     // Lets so much time pass, if it does not pass by itself.
     virtual void letPass(std::chrono::nanoseconds) { }
@@ -75,7 +75,7 @@ protected:
     {
         return [this, what = std::move(what)] { note(what); };
     }
-    // What was noted, once there is so much of it.
+    // Waits for so many notes and returns them.
     std::vector<std::string> waitForNotes(std::size_t count)
     {
         subject->work();
@@ -284,7 +284,7 @@ TEST_P(WorkQueuesContract, ASemaphoreLetsAsManyPassAsItCounts)
 
 // --- without threads
 
-TEST_P(WorkQueuesContract, MakingAQueueThrowsWhenThereIsNoThreadForItAndWorksAgainAfterwards)
+TEST_P(WorkQueuesContract, MakingAQueueThrowsWithoutAThreadForItAndWorksAgainAfterwards)
 {
     subject->setThreads(false);
     EXPECT_THROW(makeQueue(), std::system_error);
@@ -293,7 +293,7 @@ TEST_P(WorkQueuesContract, MakingAQueueThrowsWhenThereIsNoThreadForItAndWorksAga
     EXPECT_THAT(waitForNotes(1), ElementsAre("ran"));
 }
 
-TEST_P(WorkQueuesContract, WorkIsTakenAlsoWhenThereIsNoThreadForItAndRunsWithTheNext)
+TEST_P(WorkQueuesContract, WorkIsTakenWithoutAThreadForItTooAndRunsWithTheNext)
 {
     WorkQueue& background = subject->queues().backgroundQueue();
     const auto queue = makeQueue();

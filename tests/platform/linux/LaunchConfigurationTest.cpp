@@ -1,4 +1,4 @@
-// Every way to start the service wrongly has a line of its own; and what passes between it and its manager.
+// Every wrong configuration has a line of its own; and the exchange with the service manager.
 #include "platform/linux/LaunchConfiguration.h"
 
 #include "platform/linux/process/ServiceManager.h"
@@ -163,7 +163,7 @@ TEST_F(LaunchConfigurationTest, SaysWhichDirectoryCannotBeReached)
 
 TEST_F(LaunchConfigurationTest, SaysWhichDirectoryCannotBeWrittenTo)
 {
-    // As a user who does not own it, which a privileged test has to become first.
+    // As a user who does not own the directory; a privileged test changes its user first.
     ::chmod(root.c_str(), 0755);
     ::chmod((root / "state").c_str(), 0555);
     const pid_t child = ::fork();
@@ -209,7 +209,7 @@ TEST_F(LaunchConfigurationTest, SaysWhatIsWrongWithTheLogThresholds)
               "KESTO_LOG: \"loud\" is neither a level (error, default, info or debug) nor of the form tag=level");
 }
 
-TEST_F(LaunchConfigurationTest, OnlyTheFirstProblemIsTold)
+TEST_F(LaunchConfigurationTest, OnlyTheFirstProblemIsReported)
 {
     ::unsetenv("STATE_DIRECTORY");
     set("KESTO_LOG", "loud");
@@ -307,7 +307,7 @@ protected:
     FileDescriptor manager;
 };
 
-TEST_F(ServiceManagerTest, IsToldThatTheServiceIsReady)
+TEST_F(ServiceManagerTest, IsNotifiedThatTheServiceIsReady)
 {
     listen();
     notifyReady("accepting connections");

@@ -1,4 +1,4 @@
-// The providers together: each is made from the launch configuration, and what ties them to each other works.
+// The providers together: each is made from the launch configuration, and their connections work.
 #include "platform/linux/LinuxPlatform.h"
 
 #include "platform/linux/store/StoreReader.h"

@@ -1,4 +1,4 @@
-// A real process for those who look processes up.
+// A real process for tests that look up processes.
 #pragma once
 
 #include <csignal>
@@ -10,7 +10,7 @@
 
 namespace support {
 
-// A process that does nothing but bear names.
+// A process that only has names.
 class NamedProcess {
 public:
     explicit NamedProcess(const std::string& name)

@@ -1,4 +1,4 @@
-// Where channels are published when nobody says so.
+// The default place of channels.
 #include "channels/ChannelFolder.h"
 
 #include "support/TemporaryDirectory.h"
@@ -52,7 +52,7 @@ TEST(ChannelRoot, IsThatOfTheUsersServiceWhereThereIsOne)
     EXPECT_EQ(libkesto::usualChannelRoot(), runtime / "kesto/channels");
 }
 
-TEST(ChannelRoot, IsTheSystemsWhereThereIsNoUsersSession)
+TEST(ChannelRoot, IsTheSystemsWithoutAUsersSession)
 {
     const Variable root("KESTO_CHANNEL_ROOT", std::nullopt);
     const Variable directory("XDG_RUNTIME_DIR", std::nullopt);

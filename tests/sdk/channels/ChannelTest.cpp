@@ -1,4 +1,4 @@
-// The values of channels, and what their files say of them.
+// The values of channels, and the content of their files.
 #include "channels/Channel.h"
 
 #include "platform/linux/channels/ChannelFile.h"
@@ -148,7 +148,7 @@ TEST_F(Channels, ATimeThatIsShownNeverBecomesLess)
 {
     StateChannel channel(bell, {"Idle", "Running"}, 0, begin);
     EXPECT_EQ(textOf(channel, milliseconds(50)), "state\nIdle 1 50 1.000000\nRunning 0 0 0.000000\n");
-    // As from a thread that looked at the clock before the file was written.
+    // As from a thread that read the clock before the file was written.
     channel.enter(1, begin + milliseconds(40));
     EXPECT_EQ(textOf(channel, milliseconds(50)), "state\nIdle 1 50 0.833333\nRunning 1 10 0.166667\n");
 }
@@ -166,8 +166,7 @@ TEST_F(Channels, StatesLoseNoTimeWhenManyEnterAtOnce)
     EXPECT_GE(total + after->states.size(), static_cast<std::uint64_t>(now.count())) << "and none is lost";
 }
 
-// What is shown may run ahead of a thread that looked at the clock and enters its state late, so no sum is looked at
-// here.
+// The shown times may run ahead of a thread that read the clock and enters its state late, so this does not check sums.
 TEST_F(Channels, StatesNeverGoBackWhileManyEnterAtOnce)
 {
     StateChannel channel(bell, {"0", "1", "2", "3"}, 0, begin);

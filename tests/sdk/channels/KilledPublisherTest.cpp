@@ -1,4 +1,4 @@
-// What a publisher leaves when its process is killed: what the service makes of it, and what the next publisher does.
+// The files of a killed publisher: the service ignores them, and the next publisher removes them.
 #include "kesto/channels.hpp"
 #include "platform/linux/channels/ChannelTree.h"
 #include "support/TemporaryDirectory.h"
@@ -30,7 +30,7 @@ protected:
     // Publishes channels, which are groups, subgroups and names of the driver "amp"; never ends by itself.
     [[nodiscard]] bool publish(const std::vector<std::array<std::string, 3>>& names) const
     {
-        static kesto::Publisher publisher; // of the process that runs this
+        static kesto::Publisher publisher; // of the process that runs this function
         static std::vector<kesto::SimpleChannel> channels;
         kesto::PublisherOptions options;
         options.root = root;
@@ -171,7 +171,7 @@ TEST_F(KilledPublisherTest, LivesInAnotherNamespaceOfProcessesToo)
     EXPECT_EQ(status, 0);
 }
 
-// --- the publisher that lives
+// --- the living publisher
 
 TEST_F(KilledPublisherTest, APublisherThatEndsLeavesNothing)
 {
@@ -193,11 +193,11 @@ TEST_F(KilledPublisherTest, APublisherThatEndsLeavesNothing)
     EXPECT_TRUE(fs::is_empty(root));
 }
 
-TEST_F(KilledPublisherTest, APublisherIsSeenByOtherUsersWhateverItsUmask)
+TEST_F(KilledPublisherTest, APublisherIsSeenByOtherUsersDespiteItsUmask)
 {
     constexpr uid_t nobody = 65534;
     if (::geteuid() != 0)
-        GTEST_SKIP() << "only root can become somebody else";
+        GTEST_SKIP() << "only root can become another user";
     for (const fs::path& path : {directory.path(), root})
         fs::permissions(path, fs::perms::all);
     const Victim living([this] {
@@ -210,7 +210,7 @@ TEST_F(KilledPublisherTest, APublisherIsSeenByOtherUsersWhateverItsUmask)
     EXPECT_THAT(seen, ElementsAre("a"));
 }
 
-TEST_F(KilledPublisherTest, APublisherClaimsItsFilesAnewWhenSomebodyRemovedItsOwnerFile)
+TEST_F(KilledPublisherTest, APublisherClaimsItsFilesAnewWhenItsOwnerFileWasRemoved)
 {
     kesto::PublisherOptions options;
     options.root = root;
@@ -243,7 +243,7 @@ TEST_F(KilledPublisherTest, APublisherThatMayNotClaimItsFilesWritesThemAllTheSam
     Victim killed([this] { return ::seteuid(nobody) == 0 && publish({{"Tx", "", "a"}}); });
     EXPECT_THAT(files(), ElementsAre("amp/Tx/-/a"));
     killed.kill();
-    EXPECT_THAT(channels(), ElementsAre("a")) << "nobody can know";
+    EXPECT_THAT(channels(), ElementsAre("a")) << "the lock cannot be checked";
 }
 
 } // namespace

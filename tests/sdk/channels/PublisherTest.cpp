@@ -1,4 +1,4 @@
-// Publishing through the interface for C++, and what others see of it: the service's own reader of the tree.
+// Publishing through the C++ interface, checked with the service's own reader of the tree.
 #include "kesto/channels.hpp"
 #include "platform/linux/channels/ChannelTree.h"
 #include "sdk/Allocations.h"
@@ -41,7 +41,7 @@ protected:
         EXPECT_THAT(reading.channels, SizeIs(1));
         return reading.channels.empty() ? -1 : reading.channels[0].value;
     }
-    // Whether the publisher's thread has written that value before patience is at its end.
+    // Whether the publisher's thread writes that value before the time is over.
     [[nodiscard]] bool waitForValue(std::int64_t expected) const
     {
         const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
@@ -49,7 +49,7 @@ protected:
             std::this_thread::yield();
         return value() == expected;
     }
-    // What stands in a folder, hidden files too.
+    // The names in a folder, hidden files too.
     static std::vector<std::string> namesIn(const fs::path& folder)
     {
         std::vector<std::string> names;
@@ -151,7 +151,7 @@ TEST_F(PublisherTest, RemovesAChannelsFileAndItsFoldersWithIt)
     EXPECT_TRUE(fs::exists(root));
 }
 
-TEST_F(PublisherTest, RemovesWhateverIsLeftWhenItGoes)
+TEST_F(PublisherTest, RemovesAllItsFilesWhenItGoes)
 {
     kesto_channel* channel = nullptr;
     const kesto_channel_name name{"amp", "Tx", nullptr, "a"};
@@ -195,7 +195,7 @@ TEST_F(PublisherTest, LeavesNoFileButTheChannels)
     EXPECT_GE(publisher.statistics().files_written, 11U);
 }
 
-TEST_F(PublisherTest, ShowsWhoeverReadsAWholeFile)
+TEST_F(PublisherTest, ShowsReadersWholeFiles)
 {
     kesto::HistogramChannel channel;
     std::vector<std::int64_t> bounds;
@@ -221,7 +221,7 @@ TEST_F(PublisherTest, ShowsWhoeverReadsAWholeFile)
     writer.join();
 }
 
-TEST_F(PublisherTest, LetsOthersReadWhateverTheUmask)
+TEST_F(PublisherTest, LetsOthersReadDespiteTheUmask)
 {
     const mode_t before = ::umask(077);
     kesto::SimpleChannel channel;
@@ -268,7 +268,7 @@ TEST_F(PublisherTest, EntersNoFolderThroughALink)
     EXPECT_THAT(namesIn(directory / "elsewhere"), IsEmpty());
 }
 
-TEST_F(PublisherTest, EntersNoFolderThatBelongsToSomebodyElse)
+TEST_F(PublisherTest, EntersNoFolderOfAnotherUser)
 {
     constexpr uid_t nobody = 65534;
     fs::create_directories(root + "/amp");
@@ -284,7 +284,7 @@ TEST_F(PublisherTest, TellsWhyItMayNotWriteAndNotWhatCameAfterThat)
 {
     constexpr uid_t nobody = 65534;
     if (::geteuid() != 0)
-        GTEST_SKIP() << "only root can become somebody else";
+        GTEST_SKIP() << "only root can become another user";
     fs::create_directories(root + "/amp");
     fs::permissions(directory.path(), fs::perms(0755));
     kesto::SimpleChannel channel;
@@ -323,7 +323,7 @@ TEST_F(PublisherTest, CannotCreateAChannelWhereItsFileCannotBe)
 
 // --- names
 
-TEST_F(PublisherTest, MakesNamesOfFilesOfWhateverItIsGiven)
+TEST_F(PublisherTest, MakesNamesOfFilesOfAnyNames)
 {
     kesto::SimpleChannel channel;
     ASSERT_EQ(channel.create(publisher, {"../../amp", "a/b", ".hidden", "line\nbreak\x7F"}), Status::Ok);
@@ -503,7 +503,7 @@ protected:
     RarePublisherTest() : PublisherTest({"", std::chrono::hours(1), milliseconds::max()}) { }
 };
 
-TEST_F(RarePublisherTest, WritesAFileNoMoreOftenThanItIsTold)
+TEST_F(RarePublisherTest, WritesAFileNoMoreOftenThanItsInterval)
 {
     kesto::SimpleChannel channel;
     ASSERT_EQ(channel.create(publisher, {"amp", "Tx", "", "a"}), Status::Ok);
@@ -530,7 +530,7 @@ protected:
     FreshPublisherTest() : PublisherTest({"", milliseconds(1), milliseconds(1)}) { }
 };
 
-TEST_F(FreshPublisherTest, ShowsHowLongAStateLastsThoughNobodyTouchesIt)
+TEST_F(FreshPublisherTest, ShowsTheGrowingTimeOfAStateWithoutACall)
 {
     kesto::StateChannel channel;
     ASSERT_EQ(channel.create(publisher, {"amp", "Tx", "", "a"}, {"Idle"}), Status::Ok);

@@ -1,4 +1,4 @@
-// Payloads are built when a test asks for them, never before: whether they are needed is for the test to say.
+// Payloads are built only when a test asks for them, because the test decides whether they are needed.
 #include "support/fakes/FakeAnalytics.h"
 
 #include "foundation/values/Json.h"

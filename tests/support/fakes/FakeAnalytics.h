@@ -1,5 +1,5 @@
-// An analytics service that keeps what it is sent. It is as lazy as a service may be: a payload is built when the
-// test looks at it, and never before. What nobody wants is gone at once.
+// An analytics service that keeps the sent events. It is as lazy as a service may be: it builds a payload only when the
+// test reads it. It drops unwanted events at once.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -24,24 +24,24 @@ void PrintTo(const AnalyticsEvent& event, std::ostream* out);
 // Any thread.
 class FakeAnalytics final : public platform::Analytics {
 public:
-    // From now on events whose name matches the glob are wanted; none is at first.
+    // From now on events whose name matches the glob are wanted; at first none are.
     void use(std::string pattern);
 
-    // Is told each name when it is asked about.
+    // The observer gets each name that the service asks about.
     void setObserver(std::function<void(const std::string&)> observer) { observer_ = std::move(observer); }
 
     // The names asked about, and those of the events sent that were wanted, in order. Builds nothing.
     [[nodiscard]] std::vector<std::string> asked() const;
     [[nodiscard]] std::vector<std::string> sent() const;
-    // The events sent, their payloads built now unless they were before; of one name in the second form. Those whose
-    // payload JSON cannot say are lost.
+    // The sent events, in the second form only those of one name; builds missing payloads. Events whose payload JSON
+    // cannot express are lost.
     [[nodiscard]] std::vector<AnalyticsEvent> events();
     [[nodiscard]] std::vector<foundation::Dictionary> payloads(std::string_view name);
-    // The builders of the events sent, in order, for who builds the payloads; the events are forgotten.
+    // The builders of the sent events, in order, for a test that builds the payloads itself; the events are forgotten.
     [[nodiscard]] std::vector<PayloadBuilder> takeBuilders();
     // How many payloads were built.
     [[nodiscard]] int timesBuilt() const;
-    // Forgets everything but what is wanted, and lets go of the payloads not built.
+    // Forgets everything except the wanted names, and releases payloads that are not built.
     void clear();
 
     bool isAnalyticsEventUsed(std::string_view eventName) override;

@@ -1,4 +1,4 @@
-// A bug-capture service that keeps the snapshots it is asked for, and answers when the test says so.
+// A bug-capture service that keeps the requests for snapshots, and answers when the test says so.
 #pragma once
 
 #include "platform/BugCapture.h"
@@ -16,14 +16,14 @@ public:
         std::optional<foundation::Value> event;
         std::optional<foundation::Value> payload;
         platform::BugCaptureReporter::Reply reply;
-        std::int32_t sender = 0; // the current one when it was asked for
-        foundation::Value state; // of whoever asked, as it was then; null when it does not tell
+        std::int32_t sender = 0; // the current sender at the time of the request
+        foundation::Value state; // of the requesting program at that time; null without a description
     };
 
-    // The snapshots asked for, in order; `snapshots()[0].reply(...)` answers one.
+    // The requested snapshots, in order; `snapshots()[0].reply(...)` answers one.
     [[nodiscard]] std::vector<Snapshot>& snapshots() { return snapshots_; }
     [[nodiscard]] int reportersMade() const { return reportersMade_; }
-    // What a snapshot would keep of the service now; null when it does not tell.
+    // The service's present description for a snapshot; null without one.
     [[nodiscard]] foundation::Value describeState() const { return describe_ ? describe_() : foundation::Value(); }
 
     std::unique_ptr<platform::BugCaptureReporter> makeReporter() override

@@ -11,7 +11,7 @@ namespace support {
 using foundation::Array;
 using foundation::Value;
 
-// What a call holds until it is answered.
+// A call holds it until the call is answered.
 class FakeConnection::Credit {
 public:
     Credit(std::shared_ptr<FakeConnection> connection, std::size_t bytes)
@@ -56,7 +56,7 @@ bool FakeConnection::isBehind() const
     return unansweredCalls_ > mostUnansweredCalls || unansweredBytes_ > mostUnansweredBytes;
 }
 
-// Of those after a violation none is looked at.
+// Calls after a violation are ignored.
 std::expected<void, platform::Connection::Violation> FakeConnection::deliverNext()
 {
     const std::string bytes = std::move(unread_.front());
@@ -74,7 +74,7 @@ void FakeConnection::resume()
     isResumed_ = true;
 }
 
-// What a peer has said before it went counts, however far behind it was.
+// Delivers all calls that the peer made before it went.
 void FakeConnection::deliverWhatIsLeft()
 {
     while (!isInterrupted_ && !unread_.empty())
@@ -89,7 +89,7 @@ void FakeConnection::close()
         return;
     if (invalidationHandler_)
         invalidationHandler_();
-    letGo(); // nothing follows, so nothing is held any more
+    letGo(); // no call follows, so the handlers are released
 }
 
 void FakeConnection::letGo()

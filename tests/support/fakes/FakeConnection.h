@@ -1,8 +1,8 @@
 // A connection without a socket, seen from the client's side: the test makes calls, reads the answers, and ends the
 // connection in one way or the other.
 //
-// Every frame goes through its encoding in both directions, so that what a client can say, and what it cannot (hand
-// in an object of the service's own, for one), is what it is on a wire.
+// Every frame is encoded and decoded in both directions, so that a client can send exactly what is possible on a wire
+// (and cannot, for example, pass an object of the service's own).
 #pragma once
 
 #include "foundation/cbor/Cbor.h"
@@ -19,21 +19,21 @@ namespace support {
 // One thread.
 class FakeConnection final : public platform::Connection, public std::enable_shared_from_this<FakeConnection> {
 public:
-    // Beyond either, no more is read from the peer.
+    // Beyond either limit, reading from the peer pauses.
     static constexpr std::size_t mostUnansweredCalls = 32 * 1024;
     static constexpr std::size_t mostUnansweredBytes = 1024 * 1024;
 
     explicit FakeConnection(std::int32_t processIdentifier) : processIdentifier_(processIdentifier) { }
 
-    // The peer makes one call. It is delivered at once unless too much is unanswered; then it is when it can be, with
-    // the next call or with `readOn`. After a violation the connection breaks.
+    // The peer makes one call. It is delivered at once unless too many calls are unanswered; then later, with the next
+    // call or with `readOn`. After a violation the connection breaks.
     std::expected<void, Violation> call(foundation::Array frame);
     std::expected<void, Violation> readOn();
     // The frames that came back.
     [[nodiscard]] const std::vector<foundation::Array>& received() const { return received_; }
-    // How many frames were sent, those of a turn that goes on included.
+    // How many frames were sent, including those of the running turn.
     [[nodiscard]] std::size_t sent() const { return sent_; }
-    // Calls that nobody has finished working on.
+    // The number of calls that the service has not finished.
     [[nodiscard]] std::size_t unansweredCalls() const { return unansweredCalls_; }
 
     // The peer closes the connection: it is invalidated.
@@ -41,7 +41,7 @@ public:
     // The connection breaks: it is interrupted, then invalidated. Or interrupted only, for now.
     void breakOff();
     void interrupt();
-    // Lets its handlers go, which hold what will answer, which holds the connection.
+    // Releases its handlers, which hold pending answers, which hold the connection.
     void letGo();
 
     [[nodiscard]] bool isResumed() const { return isResumed_; }
@@ -52,7 +52,7 @@ public:
     void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
-    // All handlers are installed before.
+    // All handlers must be installed before.
     void resume() override;
     void send(platform::Turn& turn, std::string frame) override;
     void write(std::string letter) override;
@@ -80,7 +80,7 @@ private:
     std::size_t unansweredBytes_ = 0;
 };
 
-// Hands connections to its delegate when the test has them come.
+// Passes connections to its delegate when the test makes them.
 class FakeConnectionListener final : public platform::ConnectionListener {
 public:
     FakeConnectionListener() = default;
@@ -92,7 +92,7 @@ public:
     std::shared_ptr<FakeConnection> connect(std::int32_t processIdentifier);
 
     void setDelegate(platform::ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
-    // Keeps no thread: it is the test that has connections come.
+    // Returns at once: the test makes connections.
     void resume() override { }
     void stop() override;
 

@@ -1,5 +1,5 @@
-// What a disk refuses is refused here: a file without a folder, a folder where a file stands, and whatever leads out of
-// the root.
+// Refuses what a disk refuses: a file without a folder, a folder in place of a file, and paths that lead out of the
+// root.
 #include "support/fakes/FakeFiles.h"
 
 #include "foundation/values/Json.h"
@@ -106,7 +106,7 @@ void FakeFileSystem::keepWithin(const fs::path& folder, const platform::KeptFile
         });
 }
 
-// The files of the kind that are too many, or too large, together with those that are younger.
+// The files of the kind that exceed the limits, counted from the youngest.
 std::vector<fs::path> FakeFileSystem::beyond(const fs::path& folder, const platform::KeptFiles& kept) const
 {
     std::map<std::uint64_t, fs::path, std::greater<>> youngestFirst;

@@ -1,4 +1,4 @@
-// Files that exist only in a test's memory: those of the file system and those of the performance-data writer.
+// Files in a test's memory: those of the file system and those of the performance-data writer.
 #pragma once
 
 #include "platform/FileSystem.h"
@@ -11,23 +11,23 @@
 
 namespace support {
 
-// One thread, as is the other.
+// One thread, as the other class.
 class FakeFileSystem final : public platform::FileSystem {
 public:
-    std::map<std::filesystem::path, unsigned> directories; // with their permissions; beside the root, which is there
+    std::map<std::filesystem::path, unsigned> directories; // with their permissions; besides the root, which exists
     std::map<std::filesystem::path, std::string> files;
     struct KeptWithin {
         std::filesystem::path folder;
         platform::KeptFiles kept;
         std::uint64_t bytes;
     };
-    std::vector<KeptWithin> keptWithin; // what was told, in order
-    std::error_code directoryError; // of the next attempts, unless it is none
+    std::vector<KeptWithin> keptWithin; // the calls of `keepWithin`, in order
+    std::error_code directoryError; // the error of the next attempts, if set
     std::error_code createError;
     std::error_code writeError;
-    platform::FileSystem* disk = nullptr; // reads what `readFile` is asked for, if there is one
+    platform::FileSystem* disk = nullptr; // serves `readFile`, if set
 
-    // Without queues no folder is kept within limits.
+    // Without queues folders have no limits.
     explicit FakeFileSystem(platform::WorkQueues* queues = nullptr) : queues_(queues) { }
 
     [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return "/diagnostics"; }
@@ -47,7 +47,7 @@ private:
                                                             const platform::KeptFiles& kept) const;
 
     platform::WorkQueues* const queues_;
-    std::map<std::filesystem::path, std::uint64_t> writtenAs_; // the how-manieth of all files
+    std::map<std::filesystem::path, std::uint64_t> writtenAs_; // the sequence number among all files
     std::uint64_t written_ = 0;
 };
 
@@ -70,7 +70,7 @@ public:
 
     bool canOpen = true;
 
-    // A file is opened where the file system, which outlives the writer, would take one.
+    // Opens a file where the file system, which must outlive the writer, would accept one.
     explicit FakePerformanceWriter(FakeFileSystem& fileSystem) : fileSystem_(fileSystem) { }
 
     // The files that were opened, in order.

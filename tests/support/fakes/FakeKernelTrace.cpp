@@ -1,4 +1,4 @@
-// What a session was told is written down; events come, and sessions complete, when a test has them do so.
+// Records the calls of each session; a test delivers events and completes sessions.
 #include "support/fakes/FakeKernelTrace.h"
 
 #include <cerrno>
@@ -60,7 +60,7 @@ public:
         if (session_->queue && !std::exchange(session_->ended, true) && service_.completes)
             session_->queue->submit([session = session_] {
                 if (const auto completion = std::exchange(session->completion, nullptr))
-                    completion(); // which may destroy the session
+                    completion(); // may destroy the session
             });
     }
     [[nodiscard]] std::uint64_t lostEvents() const override { return session_->lost; }

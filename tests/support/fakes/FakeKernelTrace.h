@@ -16,7 +16,7 @@ public:
         std::uint32_t lastCode;
         std::function<void(const platform::KernelTraceEvent&)> handler;
     };
-    // What became of one session; stays when the session itself is gone, without its handlers.
+    // The record of one session; it stays when the session is destroyed, without the handlers.
     struct Session {
         bool wallTimes = false;
         bool started = false;
@@ -28,13 +28,13 @@ public:
         std::shared_ptr<platform::WorkQueue> queue;
     };
 
-    // Whether this system can trace at all, and the error numbers of the two steps that can fail.
+    // Whether this system can trace, and the error numbers of the two steps that can fail.
     bool available = true;
     int filterError = 0;
     int startError = 0;
-    // Whether sessions are completed once they have ended, started or not.
+    // Whether sessions, started or not, are completed after their end.
     bool completes = true;
-    // What a unit of time is; a nanosecond, unless it is set.
+    // The unit of time; by default a nanosecond.
     std::function<std::uint64_t(std::uint64_t)> toNanoseconds;
 
     // The sessions that were made, in order.

@@ -1,4 +1,4 @@
-// Lines are kept as they come, and shown in full by a test that fails.
+// Keeps lines in their order; a failing test shows them in full.
 #include "support/fakes/FakeLog.h"
 
 #include <algorithm>

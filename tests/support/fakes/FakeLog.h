@@ -1,4 +1,4 @@
-// A log that keeps its lines, so that tests check what was said, how loudly, and in which order.
+// A log that keeps its lines, so that tests can check their text, level and order.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -20,16 +20,16 @@ struct LogLine {
     std::string subsystem;
     std::string file; // of the statement
     int line;
-    std::string name; // what the prefix shows for the file
+    std::string name; // the file's name in the prefix
 };
 void PrintTo(const LogLine& line, std::ostream* out);
 
 // Any thread.
 class FakeLog final : public platform::Log {
 public:
-    // Everything is let through unless told otherwise before the first statement.
+    // By default all levels are enabled; call this before the first statement.
     void setThreshold(platform::LogLevel level) { threshold_ = level; }
-    // Is told every line as it comes. For those who cannot look later, such as death tests.
+    // The observer gets every line at once. For tests that cannot read the lines later, such as death tests.
     void setObserver(std::function<void(const LogLine&)> observer) { observer_ = std::move(observer); }
 
     [[nodiscard]] std::vector<LogLine> lines() const;

@@ -1,4 +1,4 @@
-// Handlers run on the queue that they were registered with, as with the real ones, and no more often than they must.
+// Handlers run on the queue of their registration, as with the real provider, and as rarely as the contract allows.
 #include "support/fakes/FakeNotifications.h"
 
 #include <utility>

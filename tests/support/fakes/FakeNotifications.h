@@ -17,7 +17,7 @@ public:
     // Gives the name a state that can be read.
     void setState(std::string name, std::uint64_t state) { states_.insert_or_assign(std::move(name), state); }
     void removeState(const std::string& name) { states_.erase(name); }
-    // Submits the handlers of the name to their queues, but for those that are still to run because of an earlier post.
+    // Submits the handlers of the name to their queues, except those that still wait because of an earlier post.
     void post(std::string_view name);
     // Makes registrations of the name fail with that status.
     void failRegistration(std::string name, platform::NotificationStatus status)
@@ -25,9 +25,9 @@ public:
         failures_.insert_or_assign(std::move(name), status);
     }
 
-    // The names that were registered; a registration's token is its place here, from 1.
+    // The registered names; a registration's token is its index here, from 1.
     [[nodiscard]] std::vector<std::string> registered() const;
-    // The tokens whose state was asked for, in order.
+    // The tokens whose state was read, in order.
     [[nodiscard]] const std::vector<std::int32_t>& asked() const { return asked_; }
 
     Registration registerNotification(std::string_view name, std::shared_ptr<platform::WorkQueue> queue,

@@ -1,4 +1,4 @@
-// A sample is a copy of what is published at that moment; a difference is what the platform would make of two.
+// A sample is a copy of the channels at that moment; a difference is computed as by the real platform.
 #include "support/fakes/FakeReportingChannels.h"
 
 #include "platform/linux/channels/ChannelDifference.h"
@@ -11,7 +11,7 @@ namespace support {
 using platform::ReportingChannel;
 using platform::ReportingSample;
 
-// A channel set is the question that found it, and how many were found.
+// A channel set keeps its query and the number of channels that it found.
 struct FakeReportingChannels::Selection final : ChannelSet {
     Selection(Name givenGroup, Name givenSubgroup)
         : group(std::move(givenGroup)),

@@ -1,4 +1,4 @@
-// Reporting channels that a test publishes and changes, with failures where it wants them.
+// Reporting channels that a test publishes and changes, with failures that it chooses.
 #pragma once
 
 #include "platform/ReportingChannels.h"
@@ -18,11 +18,11 @@ public:
     using Name = std::optional<std::string>;
     using Error = platform::ReportingChannelError;
 
-    // What goes wrong for one group and subgroup, as they are asked for.
+    // The failures of queries for one group and subgroup.
     struct Failures {
         std::optional<Error> copy;
-        bool copiesAnyway = false; // channels come back beside the error
-        bool copiesNothing = false; // neither channels nor an error come back
+        bool copiesAnyway = false; // returns channels beside the error
+        bool copiesNothing = false; // returns neither channels nor an error
         std::optional<Error> subscription;
         bool subscribesToNothing = false; // likewise
         bool subscribesAnyway = false; // channels come back beside the error
@@ -39,10 +39,10 @@ public:
     void setSampleObserver(std::function<void()> observer) { sampleObserver_ = std::move(observer); }
     void failDifferences(std::optional<Error> error) { differenceError_ = error; }
 
-    // The groups and subgroups that were asked for, in order.
+    // The queried groups and subgroups, in order.
     [[nodiscard]] const std::vector<std::pair<Name, Name>>& asked() const { return asked_; }
 
-    // No channel set comes back for an error; one without channels for a group that nobody publishes.
+    // Returns no channel set with an error, and an empty set for a group without channels.
     FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
                                       std::optional<std::string_view> subgroup) override;
     [[nodiscard]] std::size_t channelCount(const ChannelSet& channels) const override;

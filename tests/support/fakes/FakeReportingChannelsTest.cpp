@@ -1,4 +1,4 @@
-// The channels of the tests fail where a test wants it.
+// The fake channels fail as a test chooses.
 #include "support/fakes/FakeReportingChannels.h"
 
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-// A process's name is what is left of it when the kernel and the provider have looked at it.
+// A process's name is cut and cleaned as by the kernel and the real provider.
 #include "support/fakes/FakeSettings.h"
 
 #include "foundation/values/String.h"

@@ -72,10 +72,10 @@ public:
     static constexpr std::int32_t ownPID = 900;
     static constexpr const char* ownName = "kestod";
 
-    // A process that calls itself so; the kernel has room for 15 bytes of that.
+    // Adds a process of that name, which is cut to the kernel's 15 bytes.
     void add(std::int32_t processIdentifier, std::string name);
     void remove(std::int32_t processIdentifier) { names_.erase(processIdentifier); }
-    // The processes whose names were not to be believed any more, in order.
+    // The processes that were forgotten, in order.
     [[nodiscard]] const std::vector<std::int32_t>& forgotten() const { return forgotten_; }
 
     [[nodiscard]] std::int32_t ownProcessIdentifier() const override { return ownPID; }

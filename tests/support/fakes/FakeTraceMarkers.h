@@ -1,4 +1,4 @@
-// Trace markers that are kept in the order in which they were left.
+// Keeps trace markers in the order in which they were emitted.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -20,9 +20,9 @@ struct TraceMarkerEvent {
 // Any thread.
 class FakeTraceMarkers final : public platform::TraceMarkers {
 public:
-    // Is told each code as it comes.
+    // The observer gets each code at once.
     void setObserver(std::function<void(std::uint32_t)> observer) { observer_ = std::move(observer); }
-    // Whether somebody traces, as somebody does at first.
+    // Whether a trace runs; at first one does.
     void setTraced(bool isTraced)
     {
         const foundation::Lock lock(lock_);
@@ -39,7 +39,7 @@ public:
         }
         return codes;
     }
-    // The same, of anybody's.
+    // The same, for all emitters.
     std::vector<TraceMarkerEvent> takeEvents()
     {
         const foundation::Lock lock(lock_);

@@ -1,5 +1,5 @@
-// Items wait until a test runs them, in the order of all queues together; a serial queue never runs two at once, and
-// the background queue no more than the few that its threads could.
+// Items wait until a test runs them, in the order of submission over all queues; a serial queue never runs two items at
+// once, and the background queue at most as many as it has threads.
 #include "support/fakes/FakeWorkQueues.h"
 
 #include "platform/Turn.h"
@@ -37,7 +37,7 @@ private:
     const std::ptrdiff_t mostAtOnce_;
 };
 
-// While it lives, an item of the queue runs, and inside of it perhaps others.
+// While it lives, an item of the queue runs, and perhaps others inside it.
 class FakeWorkQueues::Run {
 public:
     Run(FakeWorkQueues& queues, Queue& queue) : queues_(queues) { queues_.running_.push_back(&queue); }
@@ -125,7 +125,7 @@ void FakeWorkQueues::discardAll()
 {
     delayed_.clear();
     while (!items_.empty())
-        items_.pop_front(); // one by one: letting go of an item may submit another
+        items_.pop_front(); // one by one, because releasing an item may submit another
 }
 
 std::vector<const platform::WorkQueue*> FakeWorkQueues::delayed() const

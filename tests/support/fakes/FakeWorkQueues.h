@@ -25,7 +25,7 @@ public:
         friend bool operator==(const MadeQueue&, const MadeQueue&) = default;
     };
 
-    // Whether there are threads for more serial queues.
+    // Whether the system has threads for more serial queues.
     bool hasThreads = true;
 
     explicit FakeWorkQueues(FakeClock& clock);
@@ -33,13 +33,13 @@ public:
     FakeWorkQueues(const FakeWorkQueues&) = delete;
     FakeWorkQueues& operator=(const FakeWorkQueues&) = delete;
 
-    // Runs what was submitted, and what that submits, until nothing is left.
+    // Runs all items, and the items that these submit, until none is left.
     void runAll();
-    // Runs the oldest item that may run; false when there is none.
+    // Runs the oldest item that may run; false without one.
     bool runOne();
     // Moves the clock on, and runs all delayed work that falls due on the way, at its time.
     void advance(std::chrono::nanoseconds duration);
-    // Drops what has not run.
+    // Drops all waiting items.
     void discardAll();
 
     // How many items wait to be run.
@@ -49,14 +49,14 @@ public:
     // The serial queues that were made, in order.
     [[nodiscard]] const std::vector<MadeQueue>& made() const { return made_; }
 
-    // Throws as a thread does that cannot be started.
+    // Throws as when a thread cannot be started.
     std::shared_ptr<platform::WorkQueue> makeSerialQueue(std::string_view name,
                                                          platform::SerialQueueOptions options) override;
     std::shared_ptr<platform::TurnQueue> makeTurnQueue(std::string_view name,
                                                        platform::SerialQueueOptions options) override;
     platform::WorkQueue& backgroundQueue() override;
     void submitAfter(std::chrono::nanoseconds delay, platform::WorkQueue& queue, platform::WorkItem item) override;
-    // Waiting for it runs other work, and throws std::logic_error when that cannot help.
+    // Waiting for it runs other work, and throws std::logic_error if no work is left.
     std::unique_ptr<platform::Semaphore> makeSemaphore(unsigned initialCount) override;
 
 private:

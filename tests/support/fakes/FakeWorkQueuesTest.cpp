@@ -1,4 +1,4 @@
-// The work queues of the tests are worth as much as they resemble real ones.
+// The fake work queues behave like real ones.
 #include "support/fakes/FakeWorkQueues.h"
 
 #include "support/fakes/FakeConnection.h"

@@ -1,4 +1,4 @@
-// The command line itself: help, version, what is wrong with it, and output that cannot be written.
+// The command line itself: help, version, its errors, and output that cannot be written.
 #include "tools/kesto/Tool.h"
 
 #include <gmock/gmock.h>
@@ -45,7 +45,7 @@ void PrintTo(const WrongLine& line, std::ostream* out)
 
 class WrongCommandLine : public CommandLine, public testing::WithParamInterface<WrongLine> { };
 
-TEST_P(WrongCommandLine, IsToldAndEndsWithStatus2)
+TEST_P(WrongCommandLine, IsReportedAndEndsWithStatus2)
 {
     const Finished finished = tool.run(GetParam().arguments);
     EXPECT_EQ(finished.status, 2);
@@ -55,31 +55,31 @@ TEST_P(WrongCommandLine, IsToldAndEndsWithStatus2)
 
 INSTANTIATE_TEST_SUITE_P(
     OfEveryKind, WrongCommandLine,
-    testing::Values(WrongLine{"NoVerb", {}, "subcommand is required"}, WrongLine{"AnUnknownVerb", {"play"}, "play"},
-                    WrongLine{"AnUnknownOption", {"events", "--loud"}, "--loud"},
-                    WrongLine{"AnOptionWithoutItsValue", {"events", "--name"}, "--name"},
-                    WrongLine{"ATimeThatIsNone", {"events", "--since", "soon"}, "\"soon\" is no time"},
-                    WrongLine{"ANegativeCount", {"events", "--count", "-1"}, "--count"},
-                    WrongLine{"ACountThatIsNoNumber", {"events", "--count", "few"}, "few"},
-                    WrongLine{"ANegativeWait", {"client", "--wait", "-1"}, "--wait"},
-                    WrongLine{"PrefsWithoutAVerb", {"prefs"}, "subcommand is required"},
-                    WrongLine{"PrefsWithAnUnknownVerb", {"prefs", "toggle", "a", "b"}, "toggle"},
-                    WrongLine{"GettingWithoutAKey", {"prefs", "get", "com.quarn.kesto"}, "KEY"},
-                    WrongLine{"SettingWithoutAValue", {"prefs", "set", "com.quarn.kesto", "key"}, "VALUE"},
-                    WrongLine{"SettingWithTwoValues", {"prefs", "set", "com.quarn.kesto", "key", "a", "b"}, "b"},
-                    WrongLine{
-                        "ADomainThatLeadsElsewhere", {"prefs", "get", "../kesto", "key"}, "\"../kesto\" is no domain"},
-                    WrongLine{"ADomainThatIsHidden", {"prefs", "list", ".kesto"}, "\".kesto\" is no domain"},
-                    WrongLine{"NotifyingNothing", {"notify"}, "NAME"},
-                    WrongLine{"ANotificationThatLeadsElsewhere", {"notify", "../name"}, "cannot be the name"},
-                    WrongLine{"ANotificationThatIsHidden", {"notify", ".name"}, "cannot be the name"},
-                    WrongLine{"ANotificationThatIsTooLong", {"notify", std::string(256, 'x')}, "cannot be the name"},
-                    WrongLine{"AStateThatIsNoNumber", {"notify", "name", "on"}, "\"on\" is no state"},
-                    WrongLine{"AStateThatIsNegative", {"notify", "name", "-1"}, "\"-1\" is no state"},
-                    WrongLine{"AStateThatIsTooLarge", {"notify", "name", "18446744073709551616"}, "is no state"},
-                    WrongLine{"AStateThatIsHexadecimal", {"notify", "name", "0x1"}, "is no state"},
-                    WrongLine{"AStateThatIsEmpty", {"notify", "name", ""}, "is no state"},
-                    WrongLine{"NoSummary", {"summary"}, "FILE"}),
+    testing::Values(
+        WrongLine{"NoVerb", {}, "subcommand is required"}, WrongLine{"AnUnknownVerb", {"play"}, "play"},
+        WrongLine{"AnUnknownOption", {"events", "--loud"}, "--loud"},
+        WrongLine{"AnOptionWithoutItsValue", {"events", "--name"}, "--name"},
+        WrongLine{"ATimeThatIsMalformed", {"events", "--since", "soon"}, "\"soon\" is not a time"},
+        WrongLine{"ANegativeCount", {"events", "--count", "-1"}, "--count"},
+        WrongLine{"ACountThatIsNotANumber", {"events", "--count", "few"}, "few"},
+        WrongLine{"ANegativeWait", {"client", "--wait", "-1"}, "--wait"},
+        WrongLine{"PrefsWithoutAVerb", {"prefs"}, "subcommand is required"},
+        WrongLine{"PrefsWithAnUnknownVerb", {"prefs", "toggle", "a", "b"}, "toggle"},
+        WrongLine{"GettingWithoutAKey", {"prefs", "get", "com.quarn.kesto"}, "KEY"},
+        WrongLine{"SettingWithoutAValue", {"prefs", "set", "com.quarn.kesto", "key"}, "VALUE"},
+        WrongLine{"SettingWithTwoValues", {"prefs", "set", "com.quarn.kesto", "key", "a", "b"}, "b"},
+        WrongLine{"ADomainThatLeadsElsewhere", {"prefs", "get", "../kesto", "key"}, "\"../kesto\" is not a domain"},
+        WrongLine{"ADomainThatIsHidden", {"prefs", "list", ".kesto"}, "\".kesto\" is not a domain"},
+        WrongLine{"NotifyingNothing", {"notify"}, "NAME"},
+        WrongLine{"ANotificationThatLeadsElsewhere", {"notify", "../name"}, "cannot be the name"},
+        WrongLine{"ANotificationThatIsHidden", {"notify", ".name"}, "cannot be the name"},
+        WrongLine{"ANotificationThatIsTooLong", {"notify", std::string(256, 'x')}, "cannot be the name"},
+        WrongLine{"AStateThatIsNotANumber", {"notify", "name", "on"}, "\"on\" is not a state"},
+        WrongLine{"AStateThatIsNegative", {"notify", "name", "-1"}, "\"-1\" is not a state"},
+        WrongLine{"AStateThatIsTooLarge", {"notify", "name", "18446744073709551616"}, "is not a state"},
+        WrongLine{"AStateThatIsHexadecimal", {"notify", "name", "0x1"}, "is not a state"},
+        WrongLine{"AStateThatIsEmpty", {"notify", "name", ""}, "is not a state"},
+        WrongLine{"NoSummary", {"summary"}, "FILE"}),
     [](const auto& line) { return line.param.name; });
 
 TEST_F(CommandLine, OutputThatCannotBeWrittenIsAFailure)

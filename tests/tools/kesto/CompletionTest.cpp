@@ -1,4 +1,4 @@
-// What bash offers to complete a command line with.
+// The completions that bash offers.
 #include "tools/kesto/Tool.h"
 
 #include <gmock/gmock.h>

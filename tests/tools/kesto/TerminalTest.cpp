@@ -1,4 +1,4 @@
-// What reaches a terminal, and how wide it is.
+// The text for a terminal, and its width.
 #include "kesto/Terminal.h"
 
 #include <gtest/gtest.h>

@@ -1,4 +1,4 @@
-// The tool inherits the test's environment but for what would lead it to a service of this machine.
+// The tool inherits the test's environment, without variables that would lead it to a service of this machine.
 #include "tools/kesto/Tool.h"
 
 #include <gtest/gtest.h>
@@ -33,7 +33,7 @@ Process::Arguments Tool::command(const Arguments& arguments) const
     return command;
 }
 
-// What is set later counts.
+// The last setting of a variable counts.
 static Process::Environment lastOfEach(const Process::Environment& environment)
 {
     const auto nameOf = [](const std::string& variable) { return variable.substr(0, variable.find('=')); };

@@ -19,20 +19,20 @@ class Tool {
 public:
     using Arguments = std::vector<std::string>;
 
-    // The directories are run, state and configuration below that root; times are in UTC.
+    // Uses the directories run, state and configuration below that root; times are in UTC.
     explicit Tool(const std::filesystem::path& root);
 
-    // "NAME=value", or "NAME" to have no such variable.
+    // "NAME=value", or "NAME" to remove the variable.
     void setVariable(const std::string& variable) { environment_.push_back(variable); }
-    // From now on the tool has no rights of its own, as far as that can be; the root's directories are open to it.
+    // From now on the tool runs without special rights, as far as possible; it may use the root's directories.
     void giveUpRights() { hasRights_ = false; }
 
-    // To its end, with that input.
+    // Runs the tool to its end with that input.
     [[nodiscard]] Finished run(const Arguments& arguments, const std::string& input = {}) const;
-    // What it prints when it must succeed and has nothing to complain about.
+    // The output of a run that must succeed without error messages.
     [[nodiscard]] std::string print(const Arguments& arguments, const std::string& input = {}) const;
     [[nodiscard]] std::unique_ptr<Process> start(const Arguments& arguments) const;
-    // By a shell, with the program's path as $kesto.
+    // Runs a shell command, with the program's path as $kesto.
     [[nodiscard]] Finished runShell(const std::string& script) const;
 
 private:

@@ -38,7 +38,7 @@ protected:
         channels.deviceAppeared(source, {Direction::Input, "microphone"});
     }
 
-    // The text of a channel's file without the line of its owner, once it shows what is so now.
+    // The text of a channel's file without its owner's line, after a flush.
     [[nodiscard]] std::string file(const std::string& path)
     {
         channels.flush();
@@ -208,7 +208,7 @@ TEST_F(DeviceChannelsTest, ADeviceWithoutAUsableNameIsNotCountedAsAllTogether)
     EXPECT_EQ(file("Tx/unnamed#3/cycles"), "simple\n0\n");
 }
 
-TEST_F(DeviceChannelsTest, TheLongestNamesAreToldApartToo)
+TEST_F(DeviceChannelsTest, TheLongestNamesDifferToo)
 {
     const std::string longest(255, 'n');
     channels.deviceAppeared(40, {Direction::Output, longest});
@@ -230,14 +230,14 @@ TEST_F(DeviceChannelsTest, WhatIsSaidOfUnknownDevicesIsIgnored)
     EXPECT_THAT(file("Speaker/-/any"), HasSubstr("Running 0 "));
 }
 
-// ---- Where nothing can be published, or somebody else was there first ----
+// ---- Where publishing fails, or another user was first ----
 
 class DeviceChannelsInTroubleTest : public testing::Test {
 protected:
     static constexpr uid_t nobody = 65534;
 
     void makeChannels() { channels.emplace(root, diagnostics); }
-    // Everything that was said since the last time, without what each line begins with.
+    // The lines since the last call, without their common beginning.
     template <typename Action> static std::string said(Action action)
     {
         testing::internal::CaptureStderr();
@@ -362,7 +362,7 @@ TEST_F(DeviceChannelsInTroubleTest, OneDeviceThatCannotBePublishedHoldsUpNoOther
     support::writeFile(root, "a file in its place");
     said([this] {
         makeChannels();
-        for (DeviceSerial serial = 40; serial < 60; ++serial) // in whichever order they come
+        for (DeviceSerial serial = 40; serial < 60; ++serial) // in any order
             channels->deviceAppeared(serial, {Direction::Output, serial < 50 ? std::to_string(serial) : "speaker"});
     });
     std::filesystem::remove(root);
@@ -374,7 +374,7 @@ TEST_F(DeviceChannelsInTroubleTest, OneDeviceThatCannotBePublishedHoldsUpNoOther
         EXPECT_TRUE(std::filesystem::exists(root / ownDriver / "Tx" / std::to_string(other) / "cycles")) << other;
 }
 
-TEST_F(DeviceChannelsInTroubleTest, WhoSquatsTheNameKeepsNobodyFromPublishing)
+TEST_F(DeviceChannelsInTroubleTest, AnotherOwnerOfTheNameDoesNotPreventPublishing)
 {
     std::filesystem::create_directories(root / ownDriver);
     if (::geteuid() != 0 || ::chown((root / ownDriver).c_str(), nobody, nobody) != 0)
@@ -389,7 +389,7 @@ TEST_F(DeviceChannelsInTroubleTest, WhoSquatsTheNameKeepsNobodyFromPublishing)
     channels.reset();
     EXPECT_THAT(drivers(), testing::IsEmpty());
 
-    std::filesystem::create_directories(root / driver / "Tx/-"); // as it would be left by a process that was killed
+    std::filesystem::create_directories(root / driver / "Tx/-"); // as a killed process would leave it
     said([this] { makeChannels(); });
     EXPECT_THAT(drivers(), ElementsAre(driver)) << "and is taken over";
     channels.reset();
@@ -411,10 +411,10 @@ TEST_F(DeviceChannelsInTroubleTest, ALinkInThePlaceOfTheNameIsAnothersToo)
     EXPECT_THAT(drivers()[0], StartsWith("pipewire-0<"));
 }
 
-TEST_F(DeviceChannelsInTroubleTest, WhatTheAdministratorMadeForTheUserIsNobodyElses)
+TEST_F(DeviceChannelsInTroubleTest, WhatTheAdministratorMadeForTheUserCountsAsTheUsers)
 {
     if (::geteuid() != 0)
-        GTEST_SKIP() << "only root can become somebody else";
+        GTEST_SKIP() << "only root can become another user";
     std::filesystem::create_directories(root / "pipewire-65534");
     std::filesystem::permissions(directory.path(), std::filesystem::perms(0755));
     std::filesystem::permissions(root, std::filesystem::perms(01777));
@@ -426,10 +426,10 @@ TEST_F(DeviceChannelsInTroubleTest, WhatTheAdministratorMadeForTheUserIsNobodyEl
     ASSERT_EQ(::seteuid(0), 0);
 }
 
-TEST_F(DeviceChannelsInTroubleTest, WhoMayNotWriteIsToldWhoseTheFolderIs)
+TEST_F(DeviceChannelsInTroubleTest, AUserWhoMayNotWriteGetsTheNameOfTheOwner)
 {
     if (::geteuid() != 0)
-        GTEST_SKIP() << "only root can become somebody else";
+        GTEST_SKIP() << "only root can become another user";
     std::filesystem::create_directories(root);
     std::filesystem::permissions(directory.path(), std::filesystem::perms(0755));
     ASSERT_EQ(::seteuid(nobody), 0);
@@ -446,7 +446,7 @@ TEST_F(DeviceChannelsInTroubleTest, WhoMayNotWriteIsToldWhoseTheFolderIs)
 TEST_F(DeviceChannelsInTroubleTest, UsersPublishBesideEachOther)
 {
     if (::geteuid() != 0)
-        GTEST_SKIP() << "only root can become somebody else";
+        GTEST_SKIP() << "only root can become another user";
     std::filesystem::create_directories(root);
     std::filesystem::permissions(directory.path(), std::filesystem::perms(0755));
     std::filesystem::permissions(root, std::filesystem::perms(01777));

@@ -1,5 +1,4 @@
-// The whole road: a sound that is really played on a real PipeWire, the program as it is shipped, a real service,
-// and the events that it stored.
+// The whole path: a sound that plays on a real PipeWire, the shipped program, a real service, and its stored events.
 
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
@@ -29,7 +28,7 @@ using testing::IsEmpty;
 
 using namespace std::chrono_literals;
 
-constexpr auto patience = 20s; // what is waited for comes within a fraction of a second
+constexpr auto patience = 20s; // events normally come within a fraction of a second
 
 class EndToEndTest : public testing::Test {
 protected:
@@ -66,7 +65,7 @@ protected:
                                                                server.socket(), "--channels", directory / "channels"},
                                       Program::Environment{});
     }
-    // Reads what the reporter says until it says that.
+    // Reads the reporter's output up to that text.
     [[nodiscard]] bool reporterSays(const std::string& what) const
     {
         auto line = reporter->readLine();
@@ -74,7 +73,7 @@ protected:
             line = reporter->readLine();
         return !line.empty();
     }
-    // The service follows those groups in which there are channels when it starts, and the first one is there too soon.
+    // The service subscribes to groups that have channels when it starts, and a first service would start too early.
     void startServiceThatFindsChannels()
     {
         ASSERT_TRUE(reporterSays("connected to the reporting service"));
@@ -87,7 +86,7 @@ protected:
         service.reset();
     }
 
-    // The first column of every row that the query yields, oldest first. Nothing when there is no store yet.
+    // The first column of every row that the query yields, oldest first. Nothing if the store does not exist yet.
     [[nodiscard]] std::vector<std::string> select(const std::string& columns, const std::string& condition) const
     {
         sqlite3* database = nullptr;
@@ -118,7 +117,7 @@ protected:
         return select("substr(name, 17)",
                       "name LIKE 'com.quarn.kesto.%' AND name NOT LIKE '%uptime' AND name NOT LIKE '%.Cavlet.%'");
     }
-    // Waits until there are so many events of that name.
+    // Waits for so many events of that name.
     [[nodiscard]] bool comes(const std::string& event, std::size_t count = 1) const
     {
         const auto end = std::chrono::steady_clock::now() + patience;
@@ -143,7 +142,7 @@ protected:
         }
         return sleeps;
     }
-    // Sound takes its time, and how much of it is what the test is about.
+    // Lets the sound play: the test is about durations.
     static void letItPlay(std::chrono::milliseconds duration) { std::this_thread::sleep_for(duration); }
 
     const std::string driver = "pipewire-" + std::to_string(::geteuid());
@@ -193,7 +192,7 @@ TEST_F(EndToEndTest, ARecordingBecomesTheseEvents)
     EXPECT_THAT(values("kesto.Record.Start", "session_input_running"), ElementsAre("1"));
 }
 
-// When something happened, as far as one can tell from outside: after the command and before its event was stored.
+// Bounds of an event's time: after the command and before the event was stored.
 struct Bracket {
     std::chrono::steady_clock::time_point earliest;
     std::chrono::steady_clock::time_point latest;
@@ -277,7 +276,7 @@ TEST_F(EndToEndTest, ASessionsEndTellsWhatTheDevicesDid)
     {
         const auto player = server.playTone("Music");
         ASSERT_TRUE(comes("kesto.Playback.Start"));
-        letItPlay(2500ms); // the profiler tells about once a second
+        letItPlay(2500ms); // the profiler reports about once a second
     }
     ASSERT_TRUE(comes("kesto.Cavlet.State"));
     ASSERT_TRUE(comes("kesto.Cavlet.Simple"));
@@ -343,12 +342,12 @@ TEST_F(EndToEndTest, AnIdleReporterWakesForNothing)
     ASSERT_TRUE(reporterSays("connected to the reporting service"));
     auto before = reporterSleeps();
     for (std::uint64_t earlier = 0; earlier != before; earlier = std::exchange(before, reporterSleeps()))
-        letItPlay(500ms); // until what is told at the beginning has been told
-    letItPlay(2500ms); // more than twice as long as publishers rest unless they are told to rest for longer
+        letItPlay(500ms); // until the reports of the beginning are done
+    letItPlay(2500ms); // more than twice the publishers' default interval
     EXPECT_EQ(reporterSleeps(), before);
 }
 
-TEST_F(EndToEndTest, AServiceThatIsKilledIsToldTheStateAgainWhenItIsBack)
+TEST_F(EndToEndTest, AKilledServiceGetsTheStateAgainWhenItIsBack)
 {
     const auto player = server.playTone("Music");
     ASSERT_TRUE(comes("kesto.Playback.Start"));
@@ -424,7 +423,7 @@ protected:
     }
 };
 
-TEST_F(CommandLineTest, HelpAndVersionAreNoErrors)
+TEST_F(CommandLineTest, HelpAndVersionAreNotErrors)
 {
     const auto help = run({"--help"});
     EXPECT_THAT(help.firstLine, testing::HasSubstr("Reports every stream"));
@@ -446,14 +445,14 @@ TEST_F(CommandLineTest, EveryOptionOfTheHelpIsCompleted)
         EXPECT_EQ(bash.readLine(), option);
 }
 
-TEST_F(CommandLineTest, WrongUseIsToldByTheStatus)
+TEST_F(CommandLineTest, TheStatusReportsWrongUse)
 {
     EXPECT_EQ(run({"--no-such-option"}).status, 64);
     EXPECT_EQ(run({"surplus"}).status, 64);
     EXPECT_EQ(run({"--socket"}).status, 64);
 }
 
-TEST_F(CommandLineTest, ASocketThatCannotBeIsToldByTheStatus)
+TEST_F(CommandLineTest, TheStatusReportsAnImpossibleSocket)
 {
     EXPECT_EQ(run({"--socket", "/" + std::string(200, 'x')}).status, 78);
 }

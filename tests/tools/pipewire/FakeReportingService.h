@@ -1,4 +1,4 @@
-// A reporting service that only remembers what it was told.
+// A reporting service that only records its calls.
 #pragma once
 
 #include "kesto-pipewire/ReportingService.h"
@@ -21,9 +21,9 @@ public:
         ReporterID session = 0;
         std::string
             what; // "create", "service type", "configuration", "start", "Playback Start", ..., "stop", "destroy"
-        Payload payload; // of messages and configurations; a service type's stands under "type"
+        Payload payload; // of messages and configurations; a service type is under "type"
 
-        // The value under the key, or nothing when there is none, or it is of another type.
+        // The value under the key; nothing if it is missing or has another type.
         template <typename Value> [[nodiscard]] std::optional<Value> get(std::string_view key) const
         {
             for (const auto& [name, value] : payload)
@@ -37,7 +37,7 @@ public:
         }
         [[nodiscard]] double time() const { return get<double>("kestoreporting_timestamp").value_or(0); }
         [[nodiscard]] bool isMessage() const { return has("kestoreporting_timestamp"); }
-        // The message without what makes it one of its time.
+        // The message without its time stamps.
         [[nodiscard]] Payload content() const
         {
             auto rest = payload;
@@ -69,7 +69,7 @@ public:
     void stop(ReporterID session) override { calls.push_back({session, "stop", {}}); }
     void destroy(ReporterID session) override { calls.push_back({session, "destroy", {}}); }
 
-    // What was told, in order, and of messages when, such as "Playback Start 10.5", counted from `origin`.
+    // The calls in order, messages with their time since `origin`, such as "Playback Start 10.5".
     [[nodiscard]] std::vector<std::string> told(double origin) const
     {
         std::vector<std::string> texts;

@@ -1,4 +1,4 @@
-// The graph of streams, fed with every order of events that a server may tell them in.
+// The graph of streams, with every order of events that a server may send.
 
 #include "kesto-pipewire/Graph.h"
 #include "tools/pipewire/RecordingDevices.h"
@@ -58,7 +58,7 @@ TEST_F(GraphTest, OnlyStreamsAndDevicesOfAudioAreWanted)
     EXPECT_THAT(devices.news(), ElementsAre("30 output speaker", "3 output c", "4 input d", "5 output e"));
 }
 
-TEST_F(GraphTest, ADevicesStateAndLinksAreTold)
+TEST_F(GraphTest, ADevicesStateAndLinksAreReported)
 {
     addStream(node, 500);
     devices.news();
@@ -109,7 +109,7 @@ protected:
     static constexpr double justBefore = 0.001;
 };
 
-TEST_F(GraphCyclesTest, ACycleIsToldToItsDevicesAndToTheStreamsThatWereLate)
+TEST_F(GraphCyclesTest, ACycleIsReportedToItsDevicesAndToTheStreamsThatWereLate)
 {
     passCycle(1, 41, 40);
     graph.noteCycle({.began = nanosecondsAt(2), .driver = NodeCycle{.node = sink}, .followers = {{.node = 40}}});
@@ -130,7 +130,7 @@ TEST_F(GraphCyclesTest, ADeviceThatFollowsAnotherIsLateByItself)
     EXPECT_THAT(devices.news(), ElementsAre("31 cycle", "30 late cycle", "31 late cycle", "30 late cycle"));
 }
 
-TEST_F(GraphCyclesTest, CyclesMissedWhileSettingOffAreNoFault)
+TEST_F(GraphCyclesTest, CyclesMissedWhileStartingDoNotCount)
 {
     passCycle(startUpTime - justBefore, 40);
     EXPECT_THAT(listener.news(), IsEmpty());
@@ -140,13 +140,13 @@ TEST_F(GraphCyclesTest, CyclesMissedWhileSettingOffAreNoFault)
     EXPECT_THAT(devices.news(), ElementsAre("30 late cycle"));
 }
 
-TEST_F(GraphCyclesTest, CyclesMissedAfterAPauseAreNoFaultEither)
+TEST_F(GraphCyclesTest, CyclesMissedAfterAPauseDoNotCountEither)
 {
     graph.setRunning(40, false, at(5));
     graph.setRunning(40, true, at(6));
-    graph.setRunning(40, true, at(6.5)); // repeats what is known
+    graph.setRunning(40, true, at(6.5)); // repeats the known state
     forget();
-    passCycle(5, 40); // which the pause interrupted
+    passCycle(5, 40); // the pause interrupted it
     passCycle(6.1, 40);
     EXPECT_THAT(devices.news(), ElementsAre("30 cycle", "30 cycle"));
     passCycle(6.3, 40);
@@ -160,7 +160,7 @@ TEST_F(GraphCyclesTest, ADeviceSetsOffWithEachOfItsRuns)
     graph.setDeviceState(31, DeviceState::Running, at(2));
     passCycle(2.1, 31);
     passCycle(2.3, 31);
-    graph.setDeviceState(31, DeviceState::Running, at(3)); // repeats what is known
+    graph.setDeviceState(31, DeviceState::Running, at(3)); // repeats the known state
     passCycle(3.1, 31);
     graph.setDeviceState(31, DeviceState::Idle, at(4));
     graph.setDeviceState(31, DeviceState::Running, at(5));
@@ -178,7 +178,7 @@ TEST_F(GraphCyclesTest, WhatIsLateBeforeItStopsWasLate)
     forget();
     passCycle(4.9, 40);
 
-    EXPECT_THAT(listener.news(), ElementsAre("500 late")) << "cycles are told in arrears";
+    EXPECT_THAT(listener.news(), ElementsAre("500 late")) << "cycles are reported after they have ended";
 }
 
 TEST_F(GraphCyclesTest, AStreamIsNotBlamedForCyclesFromBeforeItSetOff)
@@ -202,7 +202,7 @@ TEST_F(GraphCyclesTest, OthersThatAreLateMakeTheDriverLate)
     EXPECT_THAT(listener.news(), IsEmpty());
 }
 
-TEST_F(GraphCyclesTest, ARunningDeviceThatGoesIsNoStreamThatEnds)
+TEST_F(GraphCyclesTest, ARunningDeviceThatGoesDoesNotCountAsAStreamThatEnds)
 {
     graph.setRunning(40, false, at(5));
     graph.remove(sink, at(6));
@@ -238,7 +238,7 @@ TEST_F(GraphTest, AStreamAppearsWhenItIsDescribedAndOnlyOnce)
     EXPECT_THAT(listener.news(), ElementsAre("500 appeared output role=Music application=Player", "500 devices ''"));
 }
 
-TEST_F(GraphTest, TheApplicationIsItsIDElseItsBinaryElseItsNameWhoeverSaysSo)
+TEST_F(GraphTest, TheApplicationIsItsIDElseItsBinaryElseItsNameOfNodeOrClient)
 {
     const Identity none;
     const Identity all{"org.example.Player", "player", "Player"};
@@ -336,7 +336,7 @@ TEST_F(GraphTest, WhatGoesBeforeItsLinksLetsGoOfTheirOtherEnds)
     graph.remove(sink, now);
     EXPECT_THAT(devices.news(), ElementsAre("30 gone"));
     EXPECT_THAT(listener.news(), ElementsAre("502 devices ''"));
-    graph.remove(53, now); // the link's own end says nothing new
+    graph.remove(53, now); // the link's own end changes nothing more
     EXPECT_THAT(listener.news(), IsEmpty());
 }
 
@@ -354,7 +354,7 @@ TEST_F(GraphTest, AnIDThatIsUsedAgainIsAnotherStream)
     EXPECT_THAT(listener.news(), ElementsAre("501 appeared output role= application=", "501 devices ''", "501 runs"));
 }
 
-TEST_F(GraphTest, RunningIsToldWhenItChanges)
+TEST_F(GraphTest, RunningIsReportedWhenItChanges)
 {
     addStream(node, 500);
     graph.setRunning(node, false, now);

@@ -1,4 +1,4 @@
-// The script that people start a private PipeWire with does the work; here it is only held on a leash.
+// The headless-pipewire script does the work; this file starts and ends it.
 #include "tools/pipewire/HeadlessPipeWire.h"
 
 #include <gtest/gtest.h>
@@ -144,8 +144,8 @@ HeadlessPipeWire::~HeadlessPipeWire()
     clearAway();
 }
 
-// The script runs a shell that says that all is up and then lasts as long as its standard input, so that nothing
-// is left behind however the test ends.
+// The script runs a shell that reports that PipeWire is ready and then waits for the end of its standard input, so that
+// no process is left, even if the test is killed.
 void HeadlessPipeWire::start()
 {
     instance_ =

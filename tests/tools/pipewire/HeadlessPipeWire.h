@@ -12,8 +12,8 @@
 
 namespace kesto_pipewire {
 
-// A program that runs until this object ends it. Its standard input is a pipe from the test, its output
-// can be read; what it says on standard error goes to the test's.
+// A program that runs until this object ends it. Its standard input is a pipe from the test, its output can be read,
+// and its standard error is the test's.
 class Program {
 public:
     using Environment = std::map<std::string, std::string>; // in addition to the test's own
@@ -25,7 +25,7 @@ public:
     Program& operator=(const Program&) = delete;
 
     void write(const std::string& text) const;
-    // The next line of its output, or an empty one when the output has ended or nothing comes for too long.
+    // The next line of its output, or an empty one if the output has ended or none comes for too long.
     [[nodiscard]] std::string readLine() const;
     void kill(int signal) const;
     void closeInput();
@@ -47,12 +47,12 @@ public:
     HeadlessPipeWire(const HeadlessPipeWire&) = delete;
     HeadlessPipeWire& operator=(const HeadlessPipeWire&) = delete;
 
-    // Why there is none although none is broken: programs that are not installed. Else empty.
+    // The reason if it cannot run here, such as missing programs; else empty.
     [[nodiscard]] const std::string& reasonToSkip() const noexcept { return reasonToSkip_; }
 
     void start(); // after a former instance has been cleared away
     void kill() const; // PipeWire itself, without warning
-    void clearAway(); // what is left
+    void clearAway(); // removes the rest
     [[nodiscard]] std::string socket() const;
     [[nodiscard]] Program::Environment environment() const;
 
@@ -65,7 +65,7 @@ public:
     [[nodiscard]] std::unique_ptr<Program> playOverPulse(const std::string& role) const;
     [[nodiscard]] std::unique_ptr<Program> record() const;
 
-    // PulseAudio's number of the stream that plays, which is `pactl`'s name for it. There must be just one.
+    // PulseAudio's number of the playing stream, by which `pactl` names it. Exactly one stream must play.
     [[nodiscard]] std::string onlySinkInput() const;
 
 private:

@@ -1,4 +1,4 @@
-// What the observer sees of real streams on a real PipeWire without hardware.
+// The observer's reports of real streams on a real PipeWire without hardware.
 
 #include "kesto-pipewire/Observer.h"
 #include "tools/pipewire/HeadlessPipeWire.h"
@@ -21,9 +21,9 @@ namespace kesto_pipewire {
 
 namespace {
 
-constexpr double patience = 20; // seconds; what is waited for comes within a fraction of one
+constexpr double patience = 20; // seconds; events normally come within a fraction of one
 
-// A stream as the observer has told it.
+// A stream as the observer reported it.
 struct SeenStream {
     StreamDescription description;
     bool runs = false;
@@ -32,13 +32,13 @@ struct SeenStream {
     std::string devices{};
     std::vector<double> lateCycles{}; // when they began
     bool isGone = false;
-    // When it last began or ceased to run, changed its volume, and went.
+    // When it last started or stopped running, changed its volume, and went.
     double runningChangedAt = 0;
     double volumeChangedAt = 0;
     double goneAt = 0;
 };
 
-// Remembers every stream that was ever told, in the order of their appearance.
+// Records every reported stream, in the order of appearance.
 class SeenStreams : public StreamListener {
 public:
     explicit SeenStreams(std::function<void()> changed) : changed_(std::move(changed)) { }
@@ -117,7 +117,7 @@ protected:
             pw_deinit();
     }
 
-    // Lets things happen until the condition holds.
+    // Runs the loop until the condition holds.
     [[nodiscard]] bool happens(std::function<bool()> condition)
     {
         awaited = std::move(condition);
@@ -140,7 +140,7 @@ protected:
         return std::ranges::count_if(devices.cycles(), &NodeCycle::isLate);
     }
     [[nodiscard]] SeenStream& first() { return seen.streams.at(0); }
-    // Whether the stream of that number, the first being 0, runs and all is known of it.
+    // Whether the stream of that number, from 0, runs and all its properties are known.
     [[nodiscard]] bool plays(std::size_t number) const
     {
         if (seen.streams.size() <= number)
@@ -239,7 +239,7 @@ TEST_F(ObserverTest, VolumeAndMuteAreSeenOnTheScaleOfTheUser)
     EXPECT_TRUE(happens([this] { return first().volume == 1; }));
 }
 
-TEST_F(ObserverTest, TwoStreamsAtOnceAreToldApart)
+TEST_F(ObserverTest, TwoStreamsAtOnceAreDistinguished)
 {
     observer->start();
     const auto one = server.playOverPulse("music");

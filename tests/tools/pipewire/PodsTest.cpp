@@ -1,4 +1,4 @@
-// Reading PipeWire's values, from values built as a server builds them and from others that it should not.
+// Reading PipeWire's values: values as a server builds them, and malformed ones.
 
 #include "kesto-pipewire/Pods.h"
 
@@ -123,7 +123,7 @@ TEST(UserVolumeTest, IsTheCubeRootOfTheAmplitude)
 TEST(UserVolumeTest, ASliderPositionIsOneNumberHoweverItWasRounded)
 {
     EXPECT_EQ(userVolume(0.3F * 0.3F * 0.3F), 0.3);
-    EXPECT_EQ(userVolume(std::pow(19661 / 65536.0, 3)), 0.3); // what PulseAudio makes of 30 %
+    EXPECT_EQ(userVolume(std::pow(19661 / 65536.0, 3)), 0.3); // PulseAudio's value for 30 %
 }
 
 TEST(UserVolumeTest, StaysBetween0And1)
@@ -148,7 +148,7 @@ TEST(ReadVolumeTest, TheLoudestChannelCounts)
               0.5);
 }
 
-TEST(ReadVolumeTest, AnArrayThatLiesAboutItsElementsIsNone)
+TEST(ReadVolumeTest, AnArrayThatLiesAboutItsElementsIsIgnored)
 {
     const std::vector<float> large(1024);
     std::array<std::uint8_t, 8192> bytes{};
@@ -240,7 +240,7 @@ TEST(ReadFormatTest, IsSampleRateAndChannels)
     EXPECT_EQ(format, (StreamFormat{"S16LE/44100/2", 2}));
 }
 
-TEST(ReadFormatTest, ValuesThatAreNoChoicesAreReadToo)
+TEST(ReadFormatTest, ValuesThatAreNotChoicesAreReadToo)
 {
     const auto format = readFormat(PodBuilder()
                                        .object(SPA_TYPE_OBJECT_Format)
@@ -272,7 +272,7 @@ TEST(ReadFormatTest, EncodedSoundIsNamedAfterItsCoding)
     EXPECT_EQ(format, (StreamFormat{"iec958/48000", 0}));
 }
 
-TEST(ReadFormatTest, WhatIsNoFormatOfSoundIsNone)
+TEST(ReadFormatTest, OtherFormatsThanSoundAreIgnored)
 {
     EXPECT_EQ(readFormat(PodBuilder().integer(1).build()), std::nullopt);
     EXPECT_EQ(readFormat(PodBuilder().object(SPA_TYPE_OBJECT_Format).build()), std::nullopt);
@@ -362,7 +362,7 @@ TEST(ReadCyclesTest, WhoHasNotFinishedIsLate)
     EXPECT_THAT(cycles(profile.build()), ElementsAre("1000: 40, 41 late", "2000: 40 late, 41 late"));
 }
 
-TEST(ReadCyclesTest, ACycleBeginsWhenItsDriverIsToldTo)
+TEST(ReadCyclesTest, ACycleBeginsWithTheSignalOfItsDriver)
 {
     ProfileBuilder profile;
     profile.cycle(1000).driver(30, {900, 1001, 1002, 1050}).follower(40, 3).endCycle();
@@ -385,9 +385,9 @@ TEST(ReadCyclesTest, WorkIsFromAwakeToFinishWhereBothAreOfThisCycle)
     EXPECT_THAT(cycles(profile.build()), ElementsAre("1001: 40 20 ns, 41 late, 42, 43 late, driver 30"));
 }
 
-// In microseconds, as a real server told them. A follower that is paused has no part in what the driver is told when it
-// sets off again; the driver's first cycle is over before the follower is there.
-TEST(ReadCyclesTest, WhatIsToldAgainWhenADriverSetsOffAfterAPauseIsNoCycle)
+// In microseconds, recorded from a real server. A paused follower is not in the records of a driver that starts again;
+// the driver's first cycle is over before the follower takes part.
+TEST(ReadCyclesTest, ARepeatedRecordWhenADriverStartsAfterAPauseIsNotACycle)
 {
     ProfileBuilder profile;
     profile.cycleOfTwo(2010656, {1989431, 2010764, 2010867, 2010878}, 3, {2010764, 2010766, 2010802, 2010860});
@@ -401,7 +401,7 @@ TEST(ReadCyclesTest, WhatIsToldAgainWhenADriverSetsOffAfterAPauseIsNoCycle)
 }
 
 // A device that has just been plugged in.
-TEST(ReadCyclesTest, WhatIsToldBeforeADriversFirstCycleIsNone)
+TEST(ReadCyclesTest, ARecordBeforeADriversFirstCycleIsNotACycle)
 {
     ProfileBuilder profile;
     profile.cycle(6590594).driver(29, {0, 0, 0, 6569300}).follower(48, 1, {0, 6569300, 6569300, 0}).endCycle();
@@ -410,7 +410,7 @@ TEST(ReadCyclesTest, WhatIsToldBeforeADriversFirstCycleIsNone)
     EXPECT_THAT(cycles(profile.build()), ElementsAre("6569300: 48 late, driver 29 14 ns"));
 }
 
-TEST(ReadCyclesTest, AMissedCycleIsOneThoughItIsToldTwice)
+TEST(ReadCyclesTest, AMissedCycleWithTwoRecordsCountsOnce)
 {
     ProfileBuilder profile;
     profile.cycleOfTwo(1054751, {1013600, 1013600, 1019036, 1033523}, 1, {1013600, 1033526, 1033524, 1018984});
@@ -420,7 +420,7 @@ TEST(ReadCyclesTest, AMissedCycleIsOneThoughItIsToldTwice)
     EXPECT_THAT(cycles(profile.build()), ElementsAre("1033523: 42 late, driver 29 21 ns"));
 }
 
-TEST(ReadCyclesTest, WhatIsNoProfileTellsNothing)
+TEST(ReadCyclesTest, WhatIsNotAProfileGivesNoCycles)
 {
     EXPECT_THAT(cycles(PodBuilder().integer(1).build()), IsEmpty());
     EXPECT_THAT(cycles(PodBuilder().structure().integer(1).text("x").build()), IsEmpty());
@@ -439,7 +439,7 @@ TEST(ReadCyclesTest, BlocksThatAreCutShortTellNothing)
     EXPECT_THAT(cycles(profile.build()), ElementsAre("1000:"));
 }
 
-TEST(ReadCyclesTest, ACycleWithoutAClockIsNone)
+TEST(ReadCyclesTest, ACycleWithoutAClockIsIgnored)
 {
     PodBuilder profile;
     profile.structure().object(SPA_TYPE_OBJECT_Profiler);

@@ -1,4 +1,4 @@
-// A listener that remembers what it heard of devices, as lines of text, and their cycles as they were told.
+// A listener that records the events of devices as lines of text, and their cycles unchanged.
 #pragma once
 
 #include "kesto-pipewire/Device.h"
@@ -38,7 +38,7 @@ public:
     }
     void deviceGone(DeviceSerial device) override { hear(device, "gone"); }
 
-    // What was heard since the last time that it was asked for, such as "30 running".
+    // The events since the last call, such as "30 running".
     std::vector<std::string> news() { return std::exchange(heard_, {}); }
     [[nodiscard]] const std::vector<NodeCycle>& cycles() const { return cycles_; }
 

@@ -1,4 +1,4 @@
-// A listener that remembers what it heard of streams, as lines of text.
+// A listener that records the events of streams as lines of text.
 #pragma once
 
 #include "kesto-pipewire/Stream.h"
@@ -39,7 +39,7 @@ public:
     void cycleWasLate(StreamSerial stream, Moment) override { hear(stream, "late"); }
     void gone(StreamSerial stream, Moment) override { hear(stream, "gone"); }
 
-    // What was heard since the last time that it was asked for, such as "500 runs".
+    // The events since the last call, such as "500 runs".
     std::vector<std::string> news() { return std::exchange(heard_, {}); }
 
 private:

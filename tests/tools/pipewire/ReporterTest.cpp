@@ -1,4 +1,4 @@
-// What is reported of streams, tried on streams that only exist in these tests and in a time that they make.
+// The reports about streams, with streams and a clock that only exist in these tests.
 
 #include "kesto-pipewire/Reporter.h"
 #include "tools/pipewire/FakeReportingService.h"
@@ -31,7 +31,7 @@ class ReporterTest : public testing::Test {
 protected:
     ReporterTest() { reporter.serviceAppeared(); }
 
-    // A stream that has all it takes to run.
+    // A stream with all properties that it needs to run.
     void appear(StreamSerial serial, double time, const StreamDescription& description = {.application = "player"})
     {
         reporter.appeared(serial, description, at(time));
@@ -47,7 +47,7 @@ protected:
         appear(serial, time);
         run(serial, time);
     }
-    // Time goes on to that point, and what is due on the way is done when it is due.
+    // Advances the time to that point, and runs due work on the way.
     void pass(double time)
     {
         while (alarm && *alarm <= at(time).uptime) {
@@ -56,7 +56,7 @@ protected:
             reporter.settle(at(now));
         }
     }
-    // What was told since the last time that it was asked for.
+    // The reports since the last call.
     std::vector<std::string> news()
     {
         auto told = service.told(origin);
@@ -85,7 +85,7 @@ TEST_F(ReporterTest, AStreamGetsASessionWhenItAppears)
     EXPECT_EQ(service.calls[2].get<std::string>("HostApplicationDisplayID"), "player");
 }
 
-TEST_F(ReporterTest, AStreamOfNobodyGetsNoConfiguration)
+TEST_F(ReporterTest, AStreamWithoutAnApplicationGetsNoConfiguration)
 {
     appear(stream, 0, {});
 
@@ -141,7 +141,7 @@ TEST_F(ReporterTest, AStreamThatGoesWhileItRunsStopsFirst)
     EXPECT_THAT(news(), ElementsAre("Playback Stop 3", "Playback Deactivate 3", "stop", "destroy"));
 }
 
-TEST_F(ReporterTest, ThatAStreamsLinksGoWithItIsNoChangeOfRoute)
+TEST_F(ReporterTest, TheLossOfLinksWithTheStreamIsNotAChangeOfRoute)
 {
     appearAndRun(stream, 1);
     news();
@@ -152,7 +152,7 @@ TEST_F(ReporterTest, ThatAStreamsLinksGoWithItIsNoChangeOfRoute)
     EXPECT_THAT(news(), ElementsAre("Playback Stop 3", "Playback Deactivate 3.002", "stop", "destroy"));
 }
 
-TEST_F(ReporterTest, NothingIsToldOfAStreamThatIsGone)
+TEST_F(ReporterTest, NothingIsReportedOfAStreamThatHasGone)
 {
     appearAndRun(stream, 1);
     reporter.gone(stream, at(3));
@@ -243,7 +243,7 @@ TEST_F(ReporterTest, AStartDoesNotWaitForever)
     EXPECT_EQ(last().get<std::string>("active_devices"), "none");
 }
 
-TEST_F(ReporterTest, APauseIsToldWhenItHasLastedWithTheTimeAtWhichItBegan)
+TEST_F(ReporterTest, APauseIsReportedWhenItHasLastedWithTheTimeAtWhichItBegan)
 {
     appearAndRun(stream, 1);
     news();
@@ -257,7 +257,7 @@ TEST_F(ReporterTest, APauseIsToldWhenItHasLastedWithTheTimeAtWhichItBegan)
     EXPECT_THAT(news(), ElementsAre("Playback Start 9"));
 }
 
-TEST_F(ReporterTest, ADipOfAFewMillisecondsIsNoPause)
+TEST_F(ReporterTest, ADipOfAFewMillisecondsIsNotAPause)
 {
     appearAndRun(stream, 1);
     news();
@@ -269,7 +269,7 @@ TEST_F(ReporterTest, ADipOfAFewMillisecondsIsNoPause)
     EXPECT_EQ(alarm, std::nullopt);
 }
 
-TEST_F(ReporterTest, AShortSoundIsToldHoweverShort)
+TEST_F(ReporterTest, TheShortestSoundIsReported)
 {
     appear(stream, 0);
     news();
@@ -280,7 +280,7 @@ TEST_F(ReporterTest, AShortSoundIsToldHoweverShort)
     EXPECT_THAT(news(), ElementsAre("Playback Start 1", "Playback Stop 1.003"));
 }
 
-TEST_F(ReporterTest, AShortSoundIsToldThoughItsFormatWasNeverKnown)
+TEST_F(ReporterTest, AShortSoundIsReportedThoughItsFormatWasNeverKnown)
 {
     reporter.appeared(stream, {}, at(0));
     news();
@@ -292,7 +292,7 @@ TEST_F(ReporterTest, AShortSoundIsToldThoughItsFormatWasNeverKnown)
                 ElementsAre("Playback Start 1", "Playback Stop 1.003", "Playback Deactivate 1.004", "stop", "destroy"));
 }
 
-TEST_F(ReporterTest, ASecondRunIsNoRepetitionOfTheFirst)
+TEST_F(ReporterTest, ASecondRunIsNotARepetitionOfTheFirst)
 {
     appearAndRun(stream, 1);
     halt(stream, 2);
@@ -312,7 +312,7 @@ TEST_F(ReporterTest, ASecondRunIsNoRepetitionOfTheFirst)
 
 // ---- Volume ----
 
-TEST_F(ReporterTest, AChangeOfVolumeIsToldAtOnce)
+TEST_F(ReporterTest, AChangeOfVolumeIsReportedAtOnce)
 {
     appearAndRun(stream, 1);
     news();
@@ -332,7 +332,7 @@ TEST_F(ReporterTest, ARepeatedVolumeIsNotTold)
     EXPECT_THAT(news(), IsEmpty());
 }
 
-TEST_F(ReporterTest, AVolumeBeforeTheFirstStartIsToldByTheStart)
+TEST_F(ReporterTest, TheFirstStartReportsAnEarlierVolume)
 {
     appear(stream, 0);
     news();
@@ -344,7 +344,7 @@ TEST_F(ReporterTest, AVolumeBeforeTheFirstStartIsToldByTheStart)
     EXPECT_EQ(last().get<double>("PomoSessionVolume"), 0.75);
 }
 
-TEST_F(ReporterTest, AVolumeSetDuringAPauseIsTold)
+TEST_F(ReporterTest, AVolumeSetDuringAPauseIsReported)
 {
     appearAndRun(stream, 1);
     halt(stream, 2);
@@ -357,7 +357,7 @@ TEST_F(ReporterTest, AVolumeSetDuringAPauseIsTold)
     EXPECT_EQ(last().get<double>("PomoSessionVolume"), 0.75);
 }
 
-TEST_F(ReporterTest, ASliderOnTheMoveIsToldNowAndThenAndWhereItEnds)
+TEST_F(ReporterTest, AMovingSliderIsReportedNowAndThenAndAtItsEnd)
 {
     appearAndRun(stream, 0);
     news();
@@ -391,7 +391,7 @@ TEST_F(ReporterTest, AMoveToAnotherDeviceIsOneChangeOfRoute)
     EXPECT_EQ(last().get<std::string>("active_devices"), "headset");
 }
 
-TEST_F(ReporterTest, ADeviceThatComesRightBackIsNoChange)
+TEST_F(ReporterTest, ADeviceThatComesRightBackIsNotAChange)
 {
     appearAndRun(stream, 1);
     news();
@@ -417,7 +417,7 @@ TEST_F(ReporterTest, AStreamThatLosesItsDeviceStopsOnThatDeviceAndThenHasNone)
     EXPECT_EQ(last().get<std::string>("active_devices"), "none");
 }
 
-TEST_F(ReporterTest, AMoveDuringAPauseIsTold)
+TEST_F(ReporterTest, AMoveDuringAPauseIsReported)
 {
     appearAndRun(stream, 1);
     halt(stream, 2);
@@ -429,7 +429,7 @@ TEST_F(ReporterTest, AMoveDuringAPauseIsTold)
     EXPECT_THAT(news(), ElementsAre("RouteChange State 4"));
 }
 
-TEST_F(ReporterTest, AChangeOfFormatIsTold)
+TEST_F(ReporterTest, AChangeOfFormatIsReported)
 {
     appearAndRun(stream, 1);
     news();
@@ -454,7 +454,7 @@ TEST_F(ReporterTest, WhatFollowsAHeldStopWaitsForItAndKeepsItsPlace)
     EXPECT_EQ(service.callsOf("Playback Stop")[0].get<double>("PomoSessionVolume"), 0.5);
 }
 
-TEST_F(ReporterTest, ARestlessDeviceIsToldNowAndThenAndHoldsNothingUp)
+TEST_F(ReporterTest, ARestlessDeviceIsReportedNowAndThenAndDelaysNothing)
 {
     appearAndRun(stream, 0);
     news();
@@ -471,7 +471,7 @@ TEST_F(ReporterTest, ARestlessDeviceIsToldNowAndThenAndHoldsNothingUp)
                 testing::SizeIs(testing::AllOf(testing::Ge(4u), testing::Le(6u))));
 }
 
-TEST_F(ReporterTest, APauseIsToldThoughTheDeviceIsStillRestless)
+TEST_F(ReporterTest, APauseIsReportedThoughTheDeviceIsStillRestless)
 {
     appearAndRun(stream, 1);
     news();
@@ -516,7 +516,7 @@ TEST_F(ReporterTest, AfterTheQuietAnotherEpisodeBegins)
     EXPECT_THAT(news(), ElementsAre("Error IssueDetector 5", "Error IssueDetector 9"));
 }
 
-TEST_F(ReporterTest, TroubleWithoutEndIsToldOnceAMinute)
+TEST_F(ReporterTest, TroubleWithoutEndIsReportedOnceAMinute)
 {
     appearAndRun(stream, 0);
     news();
@@ -534,7 +534,7 @@ TEST_F(ReporterTest, TroubleWithoutEndIsToldOnceAMinute)
     EXPECT_EQ(cycles, 300);
 }
 
-TEST_F(ReporterTest, CyclesOfAStreamThatDoesNotRunAreNoFault)
+TEST_F(ReporterTest, CyclesOfAStreamThatDoesNotRunDoNotCount)
 {
     appear(stream, 0);
     news();
@@ -577,7 +577,7 @@ TEST_F(ReporterTest, StreamsDoNotMix)
 
 // ---- The service goes and comes ----
 
-TEST_F(ReporterTest, WithoutAServiceNothingIsTold)
+TEST_F(ReporterTest, WithoutAServiceNothingIsReported)
 {
     reporter.serviceLost();
     appearAndRun(stream, 0);
@@ -601,7 +601,7 @@ TEST_F(ReporterTest, AServiceThatComesLateLearnsTheStateOfEveryStream)
     EXPECT_EQ(last().get<double>("PomoSessionVolume"), 0.5);
 }
 
-TEST_F(ReporterTest, AServiceThatCameBackIsToldSinceWhenTheStateHasHeld)
+TEST_F(ReporterTest, AServiceThatCameBackGetsTheTimeSinceWhichTheStateHolds)
 {
     appearAndRun(stream, 1);
     reporter.volumeChanged(stream, 0.75, at(10));
@@ -645,7 +645,7 @@ TEST_F(ReporterTest, AStreamThatPausedWhileTheServiceWasAwayIsNotStarted)
     EXPECT_THAT(news(), ElementsAre("Playback Start 5"));
 }
 
-TEST_F(ReporterTest, AStopThatIsHeldWhileTheServiceComesBackIsToldAfterTheStart)
+TEST_F(ReporterTest, AStopThatIsHeldWhileTheServiceComesBackIsReportedAfterTheStart)
 {
     appearAndRun(stream, 1);
     reporter.serviceLost();
@@ -681,9 +681,9 @@ TEST_F(ReporterTest, AnAlarmThatGoesOffTooEarlyIsSetAgain)
     EXPECT_DOUBLE_EQ(alarm.value(), at(2 + settlingTime).uptime);
 }
 
-// ---- Whatever happens ----
+// ---- All sequences of events ----
 
-// One thing that happens to a stream, some time after the one before.
+// One event of a stream, some time after the event before.
 struct Happening {
     enum class Kind { Run, Halt, Volume, Devices, Format, LateCycle } kind = Kind::Run;
     double pause = 0;
@@ -707,7 +707,7 @@ protected:
         double end = 0;
     };
 
-    // Plays it all on one stream, and answers when it really ran.
+    // Applies all events to one stream, and returns its real running times.
     std::vector<Stretch> play(const std::vector<Happening>& happened)
     {
         std::vector<Stretch> ran;
@@ -743,7 +743,7 @@ protected:
             ran.back().end = time;
         return ran;
     }
-    // When it ran by what was told.
+    // Its running times according to the reports.
     [[nodiscard]] std::vector<Stretch> told() const
     {
         std::vector<Stretch> stretches;
@@ -760,7 +760,7 @@ protected:
     }
 };
 
-RC_GTEST_FIXTURE_PROP(ReporterProperty, PlayingIsToldAsItWasButForDips, ())
+RC_GTEST_FIXTURE_PROP(ReporterProperty, PlayingIsReportedAsItWasExceptDips, ())
 {
     using enum Happening::Kind;
     auto expected = play(*happenings({Run, Halt, Volume, LateCycle}));
@@ -781,7 +781,7 @@ RC_GTEST_FIXTURE_PROP(ReporterProperty, PlayingIsToldAsItWasButForDips, ())
     }
 }
 
-RC_GTEST_FIXTURE_PROP(ReporterProperty, WhatIsToldIsInOrderAndNeverRepeated, ())
+RC_GTEST_FIXTURE_PROP(ReporterProperty, ReportsAreInOrderAndNeverRepeated, ())
 {
     using enum Happening::Kind;
     play(*happenings({Run, Halt, Volume, Devices, Format, LateCycle}));

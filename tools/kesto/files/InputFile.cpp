@@ -1,4 +1,4 @@
-// Whatever cannot be read is told in one form.
+// All errors of reading have one form.
 #include "kesto/files/InputFile.h"
 
 #include "kesto/Terminal.h"

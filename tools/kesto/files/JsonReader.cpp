@@ -1,5 +1,5 @@
-// RapidJSON tells piece by piece what it reads, and keeps nothing: values are put together here, without recursion, so
-// that no text is too deep to be refused.
+// RapidJSON reports each piece and keeps none: this file builds the values, without recursion, so that it can refuse a
+// text of any depth.
 #include "kesto/files/JsonReader.h"
 
 #include <fmt/format.h>
@@ -16,12 +16,12 @@ using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
 
-constexpr unsigned deepest = 40; // the service takes 32 levels from its clients, and adds a few around them
+constexpr unsigned deepest = 40; // the service accepts 32 levels from its clients, and adds a few around them
 constexpr unsigned parseFlags =
     rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag | rapidjson::kParseFullPrecisionFlag;
 
-// What RapidJSON's reader tells: hands on each value that is complete at that depth. At depth 1 these are the elements
-// of a list, which the text must then be.
+// Receives RapidJSON's events, and passes on each complete value of the given depth. At depth 1 these are the elements
+// of a list, and the text must be a list.
 class ValueBuilder {
 public:
     using Visit = std::function<bool(Value value)>;
@@ -84,7 +84,7 @@ private:
     const Visit& visit_;
     unsigned depth_ = 0;
     bool isStoppedByVisit_ = false;
-    std::vector<Value> values_; // those that are in no container yet; keys, too
+    std::vector<Value> values_; // those that are not in a container yet; keys, too
 };
 
 } // namespace

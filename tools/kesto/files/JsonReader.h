@@ -10,10 +10,11 @@
 #include <string>
 #include <string_view>
 
-// The value of a JSON text, or nothing when it is none, not all of it, or nested deeper than the service takes.
+// The value of a JSON text; nothing if the text is not valid JSON, has more behind it, or is nested deeper than the
+// service accepts.
 [[nodiscard]] std::optional<foundation::Value> parseJson(std::string_view text);
 
-// Calls `visit` with each element of the list that the file holds; it returns false to go no further. The error says
-// why the file could not be read to its end: no JSON, no list, or nested too deep.
+// Calls `visit` with each element of the file's list; `visit` returns false to stop. The error gives the reason if the
+// file could not be read to its end: not JSON, not a list, or nested too deep.
 [[nodiscard]] std::expected<void, std::string>
 forEachJsonElement(std::FILE* file, const std::function<bool(foundation::Value element)>& visit);

@@ -1,4 +1,4 @@
-// What cannot be written is told in one form.
+// All errors of writing have one form.
 #include "kesto/files/OutputFile.h"
 
 #include "kesto/Terminal.h"

@@ -1,4 +1,4 @@
-// The files that commands write for whoever called them, where that person says.
+// Files that commands write to places that the user names.
 #pragma once
 
 #include <filesystem>

@@ -1,4 +1,5 @@
-// The new file lies on the disk as a whole before it takes the name, so that losing power leaves one or the other.
+// The new file is completely on the disk before it gets the name, so that a loss of power leaves the old or the new
+// file.
 #include "kesto/files/Replacement.h"
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -24,7 +25,7 @@ std::runtime_error failure(std::string_view what, const fs::path& path, int erro
         fmt::format("cannot {} {}: {}", what, path.native(), std::generic_category().message(error)));
 }
 
-// The owner stays another's where only root may change that.
+// Another user's file changes its owner, unless root replaces it.
 bool takeOver(int file, const struct stat& before)
 {
     return (::fchown(file, before.st_uid, before.st_gid) == 0 || errno == EPERM)

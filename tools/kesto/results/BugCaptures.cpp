@@ -1,4 +1,4 @@
-// The folder may change while it is read, for the service goes on: what vanishes meanwhile was never there.
+// The service may change the folder meanwhile: captures that vanish are left out.
 #include "kesto/results/BugCaptures.h"
 
 #include "kesto/files/JsonReader.h"
@@ -22,7 +22,7 @@ using foundation::Value;
 
 constexpr std::size_t longestFile = std::size_t{32} * 1024 * 1024; // more than the service writes
 
-// Regular files only: nothing here is a link.
+// Regular files only: captures hold no links.
 std::optional<std::string> readFile(const fs::path& path)
 {
     std::error_code error;
@@ -102,10 +102,10 @@ std::vector<BugCapture> bugCapturesIn(const fs::path& directory)
 {
     std::vector<BugCapture> captures;
     std::error_code error;
-    std::error_code ignored; // the service may take away what is just being looked at
+    std::error_code ignored; // the service may remove a capture while it is being read
     fs::directory_iterator entry(directory, error);
     if (error == std::errc::no_such_file_or_directory && fs::is_directory(directory.parent_path(), ignored))
-        return captures; // it is made with the first capture
+        return captures; // the service makes the folder with the first capture
     for (; !error && entry != fs::directory_iterator(); entry.increment(error)) {
         auto capture = parseName(entry->path().filename());
         if (!capture || !fs::is_directory(entry->symlink_status(ignored)))

@@ -1,4 +1,4 @@
-// The bugs that the service captured, as its folder shows them.
+// Reads the bugs that the service captured from its folder.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -13,15 +13,14 @@ struct BugCapture {
     std::uint64_t number = 0;
     double time = 0; // seconds since 1970
     std::filesystem::path directory;
-    foundation::Dictionary signature; // what was seen, and where
-    foundation::Dictionary response; // what whoever asked was told
-    std::optional<std::uint64_t> bytes; // of the device's state; nothing once that made room for newer ones
+    foundation::Dictionary signature; // which bug was seen, and where
+    foundation::Dictionary response; // the response to the request
+    std::optional<std::uint64_t> bytes; // of the device's state; nothing if it was removed to make room
 };
 
-// All of them, the oldest first; none where the service captured none. Throws std::runtime_error with a line for a
-// person.
+// All captures, the oldest first. Throws std::runtime_error with a line for a person.
 [[nodiscard]] std::vector<BugCapture> bugCapturesIn(const std::filesystem::path& directory);
 
-// How the device was: what each file says, by its name without extension, in the order of the names. A log is the list
-// of its lines; what cannot be read is null.
+// The state of the device: the content of each file by its name without extension, sorted by name. A log is the list of
+// its lines; a file that cannot be read is null.
 [[nodiscard]] foundation::Dictionary stateOf(const BugCapture& capture);

@@ -1,4 +1,4 @@
-// `kesto bugs`: the bugs that the service captured, as a table, or one of them with all that is known of it.
+// `kesto bugs`: the bugs that the service captured, as a table, or one with all its details.
 #include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
@@ -34,7 +34,7 @@ std::string timeText(double time)
     return foundation::localTimeText(time, "{:%Y-%m-%d %H:%M:%S}");
 }
 
-// Of a tombstone: "-".
+// "-" for a tombstone.
 std::string sizeText(const std::optional<std::uint64_t>& bytes)
 {
     constexpr std::uint64_t kibi = 1024;
@@ -47,7 +47,7 @@ std::string entryText(const Dictionary& dictionary, std::string_view key)
     return value == nullptr ? "?" : printable(shownText(*value));
 }
 
-// "haptics DSP_Playback Gimbo": the service, and what it was about.
+// "haptics DSP_Playback Gimbo": service type, category and type.
 std::string bugText(const Dictionary& signature)
 {
     return fmt::format("{} {} {}", entryText(signature, "type"), entryText(signature, "subType"),
@@ -84,7 +84,7 @@ void printJson(const Dictionary& dictionary)
     fmt::print("{}\n", line);
 }
 
-// The kernel's tables are full of tabs, which are no columns here.
+// The kernel's tables hold tabs, which do not align here.
 std::string lineText(const Value& value)
 {
     std::string text = shownText(value);
@@ -99,7 +99,7 @@ bool isContainer(const Value& value)
 
 void printBelow(const Value& value, std::size_t indent);
 
-// "key: value", or the key and what it holds below it.
+// "key: value", or the key with its content below.
 void printEntry(std::string_view key, const Value& value, std::size_t indent)
 {
     const bool isBelow = isContainer(value);
@@ -107,7 +107,7 @@ void printEntry(std::string_view key, const Value& value, std::size_t indent)
     printBelow(value, indent + 2);
 }
 
-// Each entry of a dictionary, each element of a list on a line of its own; nothing of other values.
+// Prints each entry of a dictionary or element of a list on a line of its own; nothing for other values.
 void printBelow(const Value& value, std::size_t indent)
 {
     if (const auto dictionary = value.dictionary())
@@ -127,7 +127,7 @@ void printWhole(const BugCapture& capture)
     printEntry("signature", capture.signature, 0);
     printEntry("response", capture.response, 0);
     if (!capture.bytes)
-        fmt::print("The state of the device is not kept any more: newer captures needed the room.\n");
+        fmt::print("The state of the device was removed to make room for newer captures.\n");
     for (const auto& [name, value] : stateOf(capture))
         printEntry(name, value, 0);
 }
@@ -139,7 +139,7 @@ void show(const BugsOptions& options)
         const auto found = std::ranges::find(captures, *options.number, &BugCapture::number);
         if (found == captures.end())
             throw std::runtime_error(
-                fmt::format("there is no bug {} in {}", *options.number, options.directory.native()));
+                fmt::format("bug {} does not exist in {}", *options.number, options.directory.native()));
         if (options.isJson)
             printJson(describe(*found).with("state", stateOf(*found)));
         else
@@ -159,7 +159,7 @@ void addBugsCommand(CLI::App& application, int& exitStatus)
 {
     const auto options = std::make_shared<BugsOptions>();
     CLI::App* command = application.add_subcommand("bugs", "Lists the captured bugs, or shows one");
-    command->add_option("NUMBER", options->number, "The bug to show, with all that is known of it");
+    command->add_option("NUMBER", options->number, "The bug to show with all its details");
     command->add_option("--directory", options->directory, "The captures, if they are not at their usual place");
     command->add_flag("--json", options->isJson, "One JSON object a line, for programs");
     command->callback([options, &exitStatus] {

@@ -1,4 +1,4 @@
-// `kesto channels`: what drivers publish at this moment, and on request how it changes, as the service would see it.
+// `kesto channels`: the drivers' present channels, and on request their changes, as the service sees them.
 #include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
@@ -42,7 +42,7 @@ std::filesystem::path usualRoot()
     return given.empty() ? usualRuntimeDirectory() / "channels" : std::filesystem::path(given);
 }
 
-// --- what a channel holds
+// --- the content of a channel
 
 bool isKind(const ReportingChannel& channel, platform::ChannelFormat format)
 {
@@ -84,7 +84,7 @@ std::string contentText(const ReportingChannel& channel)
     return isKind(channel, platform::ChannelFormat::Histogram) ? histogramText(channel) : statesText(channel);
 }
 
-// Whether there is something in the difference that this channel is.
+// Whether this channel of a difference is not empty.
 bool hasChanged(const ReportingChannel& difference)
 {
     return difference.value != 0
@@ -171,7 +171,7 @@ void printJson(const ReportingChannel& channel, double time)
     fmt::print("{}\n", line);
 }
 
-// --- looking
+// --- reading
 
 class ChannelsRun {
 public:
@@ -192,7 +192,7 @@ public:
             fmt::print("No channels are published in {}.\n", options_.root.native());
     }
 
-    // Prints what has changed, look by look.
+    // Prints the changes after each interval.
     void watch()
     {
         const std::chrono::duration<double> interval(options_.interval);
@@ -210,13 +210,13 @@ public:
         }
     }
 
-    // Whether the tree could be read at the last look.
+    // Whether the last reading of the tree succeeded.
     [[nodiscard]] bool hasSucceeded() const { return failure_.empty(); }
 
 private:
     using Lines = std::vector<std::string>;
 
-    // What is wrong is told when it is first met.
+    // Prints each problem when it first occurs.
     ReportingSample read()
     {
         auto reading = tree_.read(options_.selection);
@@ -270,9 +270,9 @@ private:
     const platform::ChannelTree tree_;
     const platform::SoundCards soundCards_;
     const Table table_;
-    std::vector<platform::ChannelProblem> problems_; // at the last look
-    Lines limits_; // that it met
-    Lines failure_; // why it could not be had
+    std::vector<platform::ChannelProblem> problems_; // of the last reading
+    Lines limits_; // that it exceeded
+    Lines failure_; // why it failed
 };
 
 } // namespace
@@ -282,16 +282,17 @@ void addChannelsCommand(CLI::App& application, int& exitStatus)
     constexpr double shortestInterval = 0.01;
     constexpr double longestInterval = 86'400;
     const auto options = std::make_shared<ChannelsOptions>();
-    CLI::App* command = application.add_subcommand("channels", "Lists what drivers publish, or watches it change");
+    CLI::App* command =
+        application.add_subcommand("channels", "Lists the channels of drivers, or watches their changes");
     command->add_option("--root", options->root, "The channel tree, if it is not at its usual place");
-    command->add_option("--sound", options->sound, "What the kernel tells about sound cards, if not /proc/asound");
+    command->add_option("--sound", options->sound, "The kernel's directory of sound cards, if not /proc/asound");
     command->add_option("--group", options->selection.group, "Only channels of this group");
     command->add_option("--subgroup", options->selection.subgroup, "Only channels of this subgroup");
-    CLI::Option* watch = command->add_flag("--watch", options->isWatching, "Go on, and tell what changes");
-    command->add_option("--interval", options->interval, "Seconds between two looks; 1 if it is not given")
+    CLI::Option* watch = command->add_flag("--watch", options->isWatching, "Go on, and print changes");
+    command->add_option("--interval", options->interval, "Seconds between two samples; 1 by default")
         ->check(CLI::Range(shortestInterval, longestInterval))
         ->needs(watch);
-    command->add_option("--count", options->count, "End after so many intervals")
+    command->add_option("--count", options->count, "End after this many intervals")
         ->check(CLI::NonNegativeNumber)
         ->needs(watch);
     command->add_flag("--json", options->isJson, "One JSON object a line, for programs");

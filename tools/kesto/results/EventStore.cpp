@@ -1,5 +1,5 @@
-// The database is opened through SQLite's URI, which alone can say that it does not change; what happens to its files
-// is seen by their numbers and by inotify.
+// The database is opened through SQLite's URI, the only way to declare that it does not change; changes of its files
+// are noticed by their inode numbers and by inotify.
 #include "kesto/results/EventStore.h"
 
 #include <array>
@@ -22,7 +22,7 @@ struct Finalize {
     void operator()(sqlite3_stmt* statement) const { sqlite3_finalize(statement); }
 };
 
-// 0 when there is no such file.
+// 0 if the file does not exist.
 std::uint64_t fileNumber(const fs::path& path)
 {
     struct stat status{};
@@ -51,15 +51,15 @@ std::string columnText(sqlite3_stmt* statement, int column)
 
 void EventStore::Close::operator()(sqlite3* database) const
 {
-    sqlite3_close_v2(database); // once its statements are gone
+    sqlite3_close_v2(database); // takes effect after its statements are destroyed
 }
 
 EventStore::EventStore(fs::path database) : path_(std::move(database))
 {
     std::error_code error;
     if (!fs::exists(path_, error) && !error)
-        throw EventStoreError(
-            fmt::format("there is no event store at {}: has kestod run? Name another with --database", path_.native()));
+        throw EventStoreError(fmt::format(
+            "the event store {} does not exist: has kestod run? Name another with --database", path_.native()));
     open();
 }
 
@@ -84,7 +84,7 @@ void EventStore::open()
     sqlite3_busy_timeout(opened, longestWait);
 }
 
-// Says what is wrong with the open database and closes it.
+// Returns the error of the open database and closes it.
 EventStoreError EventStore::unreadable()
 {
     EventStoreError error(fmt::format("cannot read the event store {}: {}", path_.native(),
@@ -126,7 +126,7 @@ void EventStore::forEach(const EventFilter& filter, const std::function<void(con
         throw unreadable();
 }
 
-// The write-ahead log is what changes with every commit, and it may not be there yet: so the directory is watched.
+// Every commit changes the write-ahead log, which may not exist yet: so the directory is watched.
 DatabaseWatch::DatabaseWatch(const fs::path& database) : inotify_(::inotify_init1(IN_CLOEXEC))
 {
     const fs::path directory = fs::absolute(database).parent_path();

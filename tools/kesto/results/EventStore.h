@@ -1,8 +1,8 @@
 // The service's event store, for reading: strictly read-only, beside the service while it writes.
 //
-// SQLite shares the write-ahead log through files of its own, which even a reader makes when they are not there: the
-// reader must be allowed to, and leaves them behind. A store without a log is one that nobody writes, so it is
-// opened as one that does not change, which needs no files.
+// SQLite shares the write-ahead log through files of its own, which even a reader makes if they are missing; it needs
+// the right to make them, and leaves them behind. A store without a log has no writer, so it is opened as unchanging,
+// which needs no such files.
 #pragma once
 
 #include <chrono>
@@ -27,7 +27,7 @@ struct EventFilter {
     std::string namePattern = "*"; // GLOB
     double since = 0; // seconds since 1970
     std::int64_t afterID = 0;
-    std::optional<std::int64_t> mostRecent; // at most so many, the most recent ones
+    std::optional<std::int64_t> mostRecent; // at most this many, the most recent ones
 };
 
 // A line for a person.
@@ -41,8 +41,8 @@ class EventStore {
 public:
     explicit EventStore(std::filesystem::path database);
 
-    // Opens the store again if it could not be read, if somebody has begun to write it, or has put another in its
-    // place: true in this last case, in which events are counted anew.
+    // Opens the store again if it could not be read, if it now has a writer, or if it was replaced. Returns true if it
+    // was replaced: event IDs then begin anew.
     bool refresh();
 
     // Calls `visit` with each event that passes the filter, oldest first.
@@ -59,7 +59,7 @@ private:
     const std::filesystem::path path_;
     std::unique_ptr<sqlite3, Close> database_;
     bool isUnchanging_ = false;
-    std::uint64_t file_ = 0; // its number in the file system, no other's as long as it is open
+    std::uint64_t file_ = 0; // its inode number, which is unique as long as it is open
 };
 
 // Sleeps until the files of a database may have changed.
@@ -69,7 +69,7 @@ public:
     ~DatabaseWatch();
     DatabaseWatch(const DatabaseWatch&) = delete;
     DatabaseWatch& operator=(const DatabaseWatch&) = delete;
-    // False when nothing happened for so long; without a limit it waits for ever.
+    // False if the limit passed without a change; without a limit it waits for ever.
     [[nodiscard]] bool wait(std::optional<std::chrono::milliseconds> limit) const;
 
 private:

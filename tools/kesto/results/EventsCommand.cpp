@@ -1,5 +1,4 @@
-// `kesto events`: the stored events, as a table for people or as JSON lines for programs, and on request those that
-// are still to come.
+// `kesto events`: the stored events, as a table for people or as JSON lines for programs, and on request future events.
 #include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
@@ -65,7 +64,7 @@ private:
             + fmt::format(".{:03}", static_cast<int>((time - std::floor(time)) * 1000));
     }
 
-    // "key=value key=value", but for the application, which has a column of its own.
+    // "key=value key=value", without the application, which has a column of its own.
     static std::string describe(const std::string& payload, std::string& application)
     {
         const auto value = parseJson(payload);
@@ -117,15 +116,15 @@ public:
     }
 
 private:
-    // Makes all that is there count as seen.
+    // Treats all present events as seen.
     void passOver()
     {
         filter_.mostRecent = 1;
         store_.forEach(filter_, [this](const StoredEvent& event) { filter_.afterID = event.id; });
     }
 
-    // The log is written first, and only then the commit can be seen, on a slow disk much later: so after each change
-    // it is looked a few times. A store that is just being made cannot be read yet; only if that lasts it is an error.
+    // A commit becomes visible only after the log is written, on a slow disk much later: so the command checks a few
+    // times after each change. A store that is just being made cannot be read yet; this is an error only if it lasts.
     [[noreturn]] void follow()
     {
         using std::chrono::milliseconds;
@@ -174,12 +173,12 @@ void addEventsCommand(CLI::App& application, int& exitStatus)
     CLI::App* command = application.add_subcommand("events", "Lists the stored events, the most recent last");
     command->add_option("--database", options->database, "The event store, if it is not at its usual place");
     command->add_option("--name", options->filter.namePattern,
-                        "Only events of names that match, such as 'com.quarn.*.Volume.*'");
+                        "Only events with matching names, such as 'com.quarn.*.Volume.*'");
     command->add_option("--since", options->since,
                         "Only events since then: 90s, 10m, 2h, 7d ago, or a time such as 2026-01-31T18:00:00");
-    command->add_option("--count", options->filter.mostRecent, "At most so many, the most recent ones")
+    command->add_option("--count", options->filter.mostRecent, "At most this many, the most recent ones")
         ->check(CLI::NonNegativeNumber);
-    command->add_flag("--follow", options->isFollowing, "Go on with events as they come");
+    command->add_flag("--follow", options->isFollowing, "Print further events as they come");
     command->add_flag("--json", options->isJson, "One JSON object a line, for programs");
     command->callback([options, &exitStatus] {
         if (options->database.empty())
@@ -187,8 +186,9 @@ void addEventsCommand(CLI::App& application, int& exitStatus)
         if (!options->since.empty()) {
             const auto since = parseMoment(options->since);
             if (!since)
-                throw CLI::ValidationError(
-                    "--since", "\"" + options->since + "\" is no time: write 90s, 10m, 2h, 7d or 2026-01-31T18:00:00");
+                throw CLI::ValidationError("--since",
+                                           "\"" + options->since
+                                               + "\" is not a time: write 90s, 10m, 2h, 7d or 2026-01-31T18:00:00");
             options->filter.since = *since;
         }
         EventsRun(*options).run();

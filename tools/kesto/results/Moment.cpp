@@ -1,4 +1,4 @@
-// The forms are tried one after the other; the first that takes the whole text is the one that was meant.
+// The forms are tried one after the other; the first that matches the whole text counts.
 #include "kesto/results/Moment.h"
 
 #include <array>
@@ -41,7 +41,7 @@ std::optional<double> parseTime(const std::string& text)
     for (const char* format :
          std::array{"%Y-%m-%dT%H:%M:%S", "%Y-%m-%d %H:%M:%S", "%Y-%m-%dT%H:%M", "%Y-%m-%d %H:%M", "%Y-%m-%d"}) {
         std::tm time{};
-        time.tm_isdst = -1; // whatever holds at that time
+        time.tm_isdst = -1; // the system finds out whether summer time holds
         const char* end = ::strptime(text.c_str(), format, &time);
         if (end == nullptr || !isDay(time))
             continue;
@@ -50,7 +50,7 @@ std::optional<double> parseTime(const std::string& text)
         end = ::strptime(end, "%z", &time);
         if (end == nullptr || *end != '\0')
             continue;
-        const auto offset = time.tm_gmtoff; // which `timegm` forgets
+        const auto offset = time.tm_gmtoff; // `timegm` resets it
         return static_cast<double>(::timegm(&time) - offset);
     }
     return std::nullopt;

@@ -27,7 +27,7 @@ constexpr std::size_t kindColumns = 26;
 // "0:02.105", or "1:00:02.105" from an hour on.
 std::string clockText(double seconds)
 {
-    constexpr double farthest = 1e9; // what is beyond is no time of a session
+    constexpr double farthest = 1e9; // larger values are not a session's time
     if (!(std::abs(seconds) < farthest))
         return fmt::format("{:.3g} s", seconds);
     const long long milliseconds = std::llround(std::abs(seconds) * 1000);
@@ -60,7 +60,7 @@ public:
         const auto read = forEachJsonElement(file.get(), [&](const Value& element) {
             const bool isMessage = showMessage(path, element);
             if (!isMessage)
-                problem = fmt::format("its element {} is no message under its identifier", timeline_.messages() + 1);
+                problem = fmt::format("its element {} is not a message under its identifier", timeline_.messages() + 1);
             return isMessage;
         });
         if (std::ferror(file.get()) != 0)
@@ -70,7 +70,7 @@ public:
         else if (!read)
             problem = read.error();
         if (!problem.empty())
-            throw std::runtime_error(fmt::format("{} is no summary of a session: {}", path.native(), problem));
+            throw std::runtime_error(fmt::format("{} is not a summary of a session: {}", path.native(), problem));
         showHead(path);
         showEnd();
     }
@@ -92,7 +92,7 @@ private:
         return true;
     }
 
-    // Once, and not before there is something to show.
+    // Shows the head once, before the first row.
     void showHead(const std::filesystem::path& path)
     {
         if (isHeadShown_)

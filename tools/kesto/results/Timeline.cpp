@@ -1,4 +1,4 @@
-// Of what came before, only the last message of each kind is kept, so that sessions of any length are read.
+// Only the last message of each kind is kept, so that sessions of any length can be read.
 #include "kesto/results/Timeline.h"
 
 #include "kesto/Terminal.h"
@@ -15,11 +15,11 @@ using foundation::Value;
 
 constexpr std::string_view volumeKind = "Volume_Summary";
 constexpr std::string_view playTime = "play_seconds";
-// Times, which stand in a column of their own, and what repeats the kind.
+// Times, which have a column of their own, and keys that repeat the kind.
 constexpr std::array<std::string_view, 4> notShown{"processuptime_ms", "systemuptime_sec", KestoReportingTimestampKey,
                                                    "audiotag"};
 
-// "Playback_Start" of "Playback_Start_1"; nothing of what is no identifier.
+// "Playback_Start" for "Playback_Start_1"; nothing if it is not an identifier.
 std::optional<std::string_view> kindOf(std::string_view identifier)
 {
     const std::size_t place = identifier.rfind('_');

@@ -1,5 +1,5 @@
-// What a session's messages tell a person who reads them one after the other: when each came, what it said that the one
-// of its kind before had not said, when sound ran, and which volume events the service made of it.
+// A session's messages for a person who reads them one after the other: the time of each, its differences from the
+// previous message of its kind, the stretches of sound, and the volume events that the service computed.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -19,16 +19,16 @@ struct Stretch {
     friend bool operator==(const Stretch&, const Stretch&) = default;
 };
 
-// Times are those that the messages carry, as they stand: they may be missing, and they may fall.
+// Times are those of the messages, unchanged: they may be missing, and they may decrease.
 class Timeline {
 public:
-    // Sound as the session's messages tell of it under one key.
+    // The stretches of sound according to one key of the messages.
     class Sound {
     public:
         explicit Sound(std::string_view key) : key_(key) { }
         void add(const foundation::Dictionary& payload, double time);
         [[nodiscard]] bool isRunning() const { return isRunning_; }
-        // Those that have ended and, if sound still runs, the one up to that time.
+        // The ended stretches and, if sound still runs, the present one up to that time.
         [[nodiscard]] std::vector<Stretch> stretches(double now) const;
 
     private:
@@ -47,14 +47,14 @@ public:
         Run run = Run::Silent;
     };
 
-    // One message after the other. Its identifier is its kind and number, such as "Playback_Start_1"; false if it is
-    // not. Volume events are no rows: they tell of all the session at its end.
+    // Adds the next message. Its identifier is its kind and number, such as "Playback_Start_1"; false if it has another
+    // form. Volume events have no rows, because they describe the whole session.
     [[nodiscard]] bool add(std::string_view identifier, const foundation::Dictionary& payload, std::optional<Row>& row);
 
     [[nodiscard]] std::size_t messages() const { return messages_; }
     // In seconds since 1970.
     [[nodiscard]] std::optional<double> start() const { return start_; }
-    // In seconds since the start, of the message with a time that came last.
+    // The time of the last message that has one, in seconds since the start.
     [[nodiscard]] double end() const { return now_; }
     [[nodiscard]] std::vector<Stretch> played() const { return output_.stretches(now_); }
     [[nodiscard]] std::vector<Stretch> recorded() const { return input_.stretches(now_); }

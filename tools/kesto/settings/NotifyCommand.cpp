@@ -1,5 +1,5 @@
-// `kesto notify`: posts a system notification, as any program may that writes its file: notifications/<name> in the
-// runtime directory, whose text is the state.
+// `kesto notify`: posts a system notification by writing its file: notifications/<name> in the runtime directory, whose
+// text is the state.
 #include "kesto/Commands.h"
 #include "kesto/Places.h"
 #include "kesto/files/Replacement.h"
@@ -25,7 +25,7 @@ namespace {
 struct NotifyOptions {
     fs::path directory;
     std::string name;
-    std::string state; // empty: as it is
+    std::string state; // empty: unchanged
 };
 
 std::string wrongName(const std::string& name)
@@ -42,11 +42,11 @@ std::string wrongState(const std::string& text)
     const auto [end, error] = std::from_chars(text.data(), text.data() + text.size(), state);
     if (error == std::errc() && end == text.data() + text.size())
         return {};
-    return "\"" + text + "\" is no state: a number from 0 to 18446744073709551615";
+    return "\"" + text + "\" is not a state: give a number from 0 to 18446744073709551615";
 }
 
-// Closing a file that was open for writing posts it; changing its times would post it once more. One that is not there
-// yet is made, without a state.
+// Closing a file that was open for writing posts it; changing its times would post it again. A missing file is made,
+// without a state.
 void touch(const fs::path& path)
 {
     if (std::error_code error; !fs::exists(path, error) && !error)
@@ -61,7 +61,7 @@ void notify(const NotifyOptions& options)
 {
     if (std::error_code error; !fs::exists(options.directory, error))
         throw std::runtime_error(
-            fmt::format("there is no runtime directory at {}: is kestod installed? Name another with --directory",
+            fmt::format("the runtime directory {} does not exist: is kestod installed? Name another with --directory",
                         options.directory.native()));
     const fs::path directory = options.directory / "notifications";
     makeDirectory(directory);
@@ -80,9 +80,9 @@ void addNotifyCommand(CLI::App& application, int& exitStatus)
     command->add_option("--directory", options->directory,
                         "The service's runtime directory, if it is not at its usual place");
     command->add_option("NAME", options->name, "Such as com.quarn.halden.ringerstate")->required()->check(wrongName);
-    command->add_option("STATE", options->state, "Its state from now on, a number; else it keeps the one it has")
+    command->add_option("STATE", options->state, "Its new state, a number; by default it keeps its state")
         ->check(wrongState);
-    command->footer(R"(Turns the ringer on, which every session is told:
+    command->footer(R"(Turns the ringer on and reports it to every session:
   kesto notify com.quarn.halden.ringerstate 1)");
     command->callback([options, &exitStatus] {
         if (options->directory.empty())

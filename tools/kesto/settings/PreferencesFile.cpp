@@ -1,5 +1,5 @@
-// Reading, changing and writing happen under a lock on the directory, since the file itself is replaced each time. What
-// the service would not read is not written.
+// Reading, changing and writing happen under a lock on the directory, because the file itself is replaced each time. A
+// file that the service could not read is not written.
 #include "kesto/settings/PreferencesFile.h"
 
 #include "kesto/files/Replacement.h"
@@ -33,14 +33,14 @@ std::runtime_error failure(fmt::format_string<const Arguments&...> format, const
     return std::runtime_error(fmt::format(format, arguments...));
 }
 
-// Keeps other runs of this program from changing files of the directory.
+// Keeps other instances of this program from changing files of the directory.
 class Lock {
 public:
     explicit Lock(const fs::path& directory) : directory_(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC))
     {
         if (!directory_)
             throw failure("cannot open {}: {}", directory.native(), std::generic_category().message(errno));
-        // Whoever may read the directory could hold it for ever.
+        // Waits only a limited time, because any user who may read the directory could hold the lock.
         for (int turn = 0; ::flock(directory_.get(), LOCK_EX | LOCK_NB) != 0; ++turn) {
             constexpr int mostTurns = 500;
             if (turn == mostTurns)
@@ -66,7 +66,7 @@ PreferencesFile::PreferencesFile(fs::path configurationDirectory, std::string_vi
 foundation::Dictionary PreferencesFile::values() const
 {
     if (!exists())
-        throw failure("there are no preferences of the domain {} in {}", domain_, directory_.native());
+        throw failure("the domain {} has no preferences in {}", domain_, directory_.native());
     return *platform::parseToml(read());
 }
 

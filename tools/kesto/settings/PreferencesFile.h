@@ -1,6 +1,6 @@
 // One domain's preferences, for changing: preferences/<domain>.toml in the configuration directory, in the form in
-// which the service reads it. A change is made in one step and under a lock, so that two who change different keys at
-// once both get their way.
+// which the service reads it. A change is made in one step and under a lock, so that two programs can change different
+// keys at the same time.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -10,17 +10,17 @@
 #include <string_view>
 #include <vector>
 
-// Whatever cannot be done is a std::runtime_error with a line for a person.
+// Every failure is a std::runtime_error with a line for a person.
 class PreferencesFile {
 public:
-    // The domain must be the name of one (`LinuxPreferences::isDomainName`).
+    // The domain must be valid (`LinuxPreferences::isDomainName`).
     PreferencesFile(std::filesystem::path configurationDirectory, std::string_view domain);
 
-    // All keys, sorted. There must be such a file.
+    // All keys, sorted. The file must exist.
     [[nodiscard]] foundation::Dictionary values() const;
-    // Sets the key to a value given as TOML, and makes the file if there is none.
+    // Sets the key to a value given as TOML, and makes the file if it is missing.
     void set(std::string_view key, std::string_view toml) const;
-    // Removes the key, which must be there.
+    // Removes the key, which must exist.
     void unset(std::string_view key) const;
 
     // The error that the domain lacks the key.
@@ -31,7 +31,7 @@ public:
 
 private:
     [[nodiscard]] bool exists() const;
-    // What the file says, TOML for sure.
+    // The content of the file, which is checked to be TOML.
     [[nodiscard]] std::string read() const;
     void write(const std::string& before, const std::string& after) const;
 

@@ -1,4 +1,4 @@
-// `kesto prefs`: the preferences of the device, which the service tells to its sessions, from a shell.
+// `kesto prefs`: shows and changes the preferences of the device, which the service adds to its sessions.
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
 #include "kesto/Places.h"
@@ -40,7 +40,7 @@ std::string jsonOf(const Value& value)
 {
     std::string json;
     if (!foundation::appendJson(value, json))
-        throw std::runtime_error("a number is not finite, which JSON cannot say: try without --json");
+        throw std::runtime_error("a number is not finite, which JSON cannot express: try without --json");
     return json;
 }
 
@@ -63,8 +63,8 @@ bool isTooLargeInteger(std::string_view text)
     return error == std::errc::result_out_of_range && end == digits.data() + digits.size();
 }
 
-// How the value is written in TOML: as it stands if it is TOML, else as text. What was meant to be TOML and is none, is
-// better refused than kept as text.
+// The value in TOML: unchanged if it is TOML, else as text. A value that looks like TOML but is not valid is refused
+// rather than kept as text.
 std::string spelling(const PrefsOptions& options)
 {
     constexpr std::string_view beginnings = "\"'[{";
@@ -75,9 +75,9 @@ std::string spelling(const PrefsOptions& options)
         return options.value;
     if (!text.empty() && beginnings.contains(text.front()))
         throw std::runtime_error(
-            fmt::format("{} begins like a value of TOML but is none: correct it, or say --string", text));
+            fmt::format("{} begins like a TOML value but is not valid: correct it, or use --string", text));
     if (isTooLargeInteger(text))
-        throw std::runtime_error(fmt::format("{} does not fit in 64 bits: say --string to keep it as text", text));
+        throw std::runtime_error(fmt::format("{} does not fit in 64 bits: use --string to keep it as text", text));
     return tomlString(text);
 }
 
@@ -115,7 +115,7 @@ std::string wrongDomain(const std::string& name)
 {
     if (platform::LinuxPreferences::isDomainName(name))
         return {};
-    return "\"" + name + R"(" is no domain: letters, digits, "-", "_" and ".", not beginning with ".")";
+    return "\"" + name + R"(" is not a domain: use letters, digits, "-", "_" and ".", not beginning with ".")";
 }
 
 class Verbs {
@@ -167,7 +167,7 @@ void addPrefsCommand(CLI::App& application, int& exitStatus)
     CLI::App* setting = verbs.addWithKey("set", "Sets a key to a value", set);
     setting->add_option("VALUE", verbs.options().value, "true, 5, 0.5, \"text\", [1, 2] or any other TOML, else text")
         ->required();
-    setting->add_flag("--string", verbs.options().isString, "VALUE is text, whatever it looks like");
+    setting->add_flag("--string", verbs.options().isString, "VALUE is always text");
     verbs.addWithKey("unset", "Removes a key", unset);
     CLI::App* listing = verbs.add("list", "Lists the keys of a domain, or the domains", list);
     listing->get_option("DOMAIN")->required(false);
@@ -175,5 +175,5 @@ void addPrefsCommand(CLI::App& application, int& exitStatus)
     command->footer(R"(A running service notices a change by itself:
   kesto prefs set com.quarn.kesto device_name "Kitchen radio"
   kesto prefs set com.quarn.halden spatial-audio-accessory-feature true
-What begins with "-" and is no number stands behind "--": kesto prefs set DOMAIN KEY -- -text)");
+A VALUE that begins with "-" and is not a number must follow "--": kesto prefs set DOMAIN KEY -- -text)");
 }

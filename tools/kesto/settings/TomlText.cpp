@@ -1,5 +1,5 @@
-// A statement is asked of the parser rather than searched for: each is parsed by itself, and says so which key it is
-// about. Only the ends of lines that could end one are tried.
+// The parser, not a search, finds the statements: each is parsed by itself, which gives its key. Only ends of lines
+// that may end a statement are tried.
 #include "kesto/settings/TomlText.h"
 
 #include "foundation/values/Json.h"
@@ -13,11 +13,11 @@
 
 namespace {
 
-// Some lines of the text that mean something together, or one that says nothing.
+// Lines of the text that form one statement, or one line without a statement.
 struct Statement {
     std::string text; // with the line's end
-    std::optional<std::string> key; // which key, not in a table, it is about: its own or its table's
-    bool isTable = false; // begins one
+    std::optional<std::string> key; // the key that it sets outside of tables: its own or its table's
+    bool isTable = false; // begins a table
 };
 
 char firstCharacter(std::string_view text)
@@ -45,7 +45,7 @@ std::string_view firstStatement(std::string_view text)
 
 std::vector<Statement> statementsOf(std::string_view toml)
 {
-    constexpr std::string_view byteOrderMark = "\xEF\xBB\xBF"; // says nothing, and only at the very beginning
+    constexpr std::string_view byteOrderMark = "\xEF\xBB\xBF"; // without meaning; only allowed at the beginning
     toml.remove_prefix(toml.starts_with(byteOrderMark) ? byteOrderMark.size() : 0);
     std::vector<Statement> statements;
     std::optional<std::string> table;
@@ -79,7 +79,7 @@ std::string textOf(const std::vector<Statement>& statements)
     return text;
 }
 
-// What stands behind the value: from the first "#" on without which the statement says the same.
+// The text behind the value: from the first "#" whose removal does not change the statement's meaning.
 std::string tailOf(const std::string& statement)
 {
     const auto meaning = [](std::string_view text) {
@@ -104,8 +104,8 @@ std::string tomlKey(std::string_view key)
 
 std::optional<foundation::Value> tomlValue(std::string_view text)
 {
-    // Behind the one, comments and further keys could stand; in the other, what belongs to the braces. In both,
-    // neither.
+    // After the first form comments and further keys could follow; inside the second, other members of the braces. A
+    // text that is valid in both forms has neither.
     const auto alone = platform::parseToml("value = " + std::string(text));
     const auto enclosed = platform::parseToml("table = {value = " + std::string(text) + "}");
     if (!alone || !enclosed)
@@ -116,7 +116,7 @@ std::optional<foundation::Value> tomlValue(std::string_view text)
 std::string tomlString(std::string_view text)
 {
     constexpr std::string_view hexDigits = "0123456789ABCDEF";
-    std::string json; // whose escapes TOML has, too; but it leaves the controls beyond ASCII's first as they are
+    std::string json; // TOML has its escapes, too; but it does not escape control characters beyond the first 32
     foundation::appendJsonText(text, json);
     std::string toml;
     for (std::size_t index = 0; index < json.size(); ++index) {
@@ -154,7 +154,7 @@ std::string withTomlKey(std::string_view toml, std::string_view key, std::string
             place = behindLastKey;
         else if (firstTable != statements.end()) {
             while (place != statements.begin() && isComment(*std::prev(place)))
-                --place; // which is about the table
+                --place; // this statement belongs to the table
             line += '\n';
         }
         place = statements.insert(place, Statement());

@@ -1,8 +1,8 @@
-// Setting and removing single keys in a TOML text that a person may have written: all else, comments and order
-// included, stays as it is, byte for byte.
+// Setting and removing single keys in a TOML text that a person may have written: all other parts, with comments and
+// order, stay the same, byte for byte.
 //
-// The text is cut into statements, and the service's own parser says where one ends: at the first line's end up to
-// which the text is TOML by itself. So values over many lines are cut right without a second grammar.
+// The text is cut into statements, with the service's own parser: a statement ends at the first end of a line up to
+// which the text is TOML by itself. So values over many lines are cut correctly without a second grammar.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -11,14 +11,14 @@
 #include <string>
 #include <string_view>
 
-// The value that the text is in TOML; nothing when it is none, or more than one.
+// The value of the text in TOML; nothing if it is not exactly one value.
 [[nodiscard]] std::optional<foundation::Value> tomlValue(std::string_view text);
 
-// The text as TOML has it, in quotes. Control characters are escapes.
+// The text as a quoted TOML string. Control characters become escapes.
 [[nodiscard]] std::string tomlString(std::string_view text);
 
-// The TOML text `toml`, in which `value`, TOML too, is now that of the key: in the place of the value before, with what
-// stands behind it on its line, else behind the last key that belongs to no table. Tables of that name go.
+// The TOML text `toml` with `value`, which is TOML too, as the value of the key: in place of the old value, keeping the
+// rest of its line, else behind the last key that is not in a table. Tables of that name are removed.
 [[nodiscard]] std::string withTomlKey(std::string_view toml, std::string_view key, std::string_view value);
 
 // The same without the key, or without the tables of that name. Comments in lines of their own stay.

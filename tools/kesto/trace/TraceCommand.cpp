@@ -1,4 +1,4 @@
-// `kesto trace`: shows what a trace has measured, or runs a program while a trace measures it.
+// `kesto trace`: shows the results of a trace, or runs a program while a trace measures it.
 #include "kesto/Commands.h"
 #include "kesto/files/InputFile.h"
 #include "kesto/trace/TraceRecording.h"
@@ -16,7 +16,7 @@ struct TraceOptions {
     std::string program; // to record
 };
 
-// What follows the program's name on the command line. What separates the two from the tool's own is none of it.
+// The program's name and the words behind it on the command line, without the "--" before them.
 std::vector<std::string> commandOf(const CLI::App& command, const std::string& program)
 {
     std::vector<std::string> words = command.remaining();
@@ -30,16 +30,18 @@ CLI::App* addRecordCommand(CLI::App& trace, TraceOptions& options)
 {
     CLI::App* command = trace.add_subcommand("record", "Runs a program while a trace measures, and shows the results");
     TraceRecordingOptions& recording = options.recording;
-    command->add_option("--params", recording.parameters, "The parameters file: which events begin and end what")
+    command
+        ->add_option("--params", recording.parameters,
+                     "The parameters file: the events that begin and end each measurement")
         ->required();
     command->add_option("--output", recording.output, "Keep a copy of the results file here");
     command->add_option("--socket", recording.socket, "The service's socket, if it is not at its usual place");
     command->add_option("--results", recording.results, "The service's results file, if it is not at its usual place");
     command->add_option("COMMAND", options.program, "The program to run, and its arguments; put -- before")->required();
-    command->prefix_command(); // its arguments are not this tool's
+    command->prefix_command(); // the arguments after it belong to the program
     command->footer(R"(Measures a program in one line:
   kesto trace record --params mixer.plist -- ./mixer -t 10
-Exit status: that of the program; instead of 0, 3 if something is missing in the results. 1 if nothing could be
+Exit status: that of the program; instead of 0, 3 if the results are incomplete. 1 if nothing could be
 recorded, 127 if the program could not be run.)");
     return command;
 }
@@ -49,7 +51,7 @@ recorded, 127 if the program could not be run.)");
 void addTraceCommand(CLI::App& application, int& exitStatus)
 {
     const auto options = std::make_shared<TraceOptions>();
-    CLI::App* command = application.add_subcommand("trace", "Shows what a trace has measured, or records one");
+    CLI::App* command = application.add_subcommand("trace", "Shows the results of a trace, or records one");
     CLI::Option* file =
         command->add_option("FILE", options->file,
                             "A results file, such as Audio/Traces/tracing_results.qdj of the service's log directory");

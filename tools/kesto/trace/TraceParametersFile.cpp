@@ -1,4 +1,4 @@
-// The file is understood by the service's own code, so that what is said of it is what the service will do.
+// The service's own code reads the file, so that the warnings match the service's behaviour.
 #include "kesto/trace/TraceParametersFile.h"
 
 #include "foundation/plist/PropertyList.h"
@@ -23,7 +23,7 @@ bool isCollected(std::uint32_t code)
     return code >= firstTraceCode && code <= lastTraceCode;
 }
 
-// Empty for a point that can be.
+// Empty for a point that can be measured.
 std::string whyNeverMeasured(const TraceDataParams& point)
 {
     for (const std::uint32_t code : {point.beginCode, point.endCode})
@@ -46,12 +46,13 @@ TraceParametersFile readTraceParameters(const fs::path& path)
     file.text = readInput(file.path, foundation::PropertyListLimits().bytes);
     const auto list = foundation::readPropertyList(file.text);
     if (!list)
-        throw std::runtime_error(
-            fmt::format("{} is no parameters file: {}", printable(file.path.native()), printable(list.error().text)));
+        throw std::runtime_error(fmt::format("{} is not a parameters file: {}", printable(file.path.native()),
+                                             printable(list.error().text)));
     file.params = *TraceParamsParser::paramsOf(*list);
     if (file.params.traceType == TraceParams::signpostTrace)
-        throw std::runtime_error(fmt::format("{} asks for a trace of signposts ({} is {}), which there is none of",
-                                             printable(file.path.native()), TraceDataType, TraceDataTypeOSSignpost));
+        throw std::runtime_error(
+            fmt::format("{} asks for a trace of signposts ({} is {}), which the service does not support",
+                        printable(file.path.native()), TraceDataType, TraceDataTypeOSSignpost));
     return file;
 }
 
@@ -71,10 +72,10 @@ std::vector<std::string> warningsOf(const TraceParams& params)
         const std::string which = fmt::format("point {}, \"{}\": ", index + 1, printable(point.name));
         if (!point.isTypeKnown)
             warnings.push_back(which
-                               + "its type is none of Interval, Impulse and Level, so it is taken for one like the "
+                               + "its type is not Interval, Impulse or Level, so it counts as one like the "
                                  "point before it");
         if (const std::string why = whyNeverMeasured(point); !why.empty())
-            warnings.push_back(fmt::format("{}measures nothing, for {}", which, why));
+            warnings.push_back(fmt::format("{}measures nothing, because {}", which, why));
     }
     return warnings;
 }

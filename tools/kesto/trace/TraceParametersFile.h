@@ -1,5 +1,5 @@
-// A parameters file of a trace, seen by the person who wants to measure: what of it will not be measured is said before
-// anything is run, and a service that cannot read it is given a copy.
+// A parameters file of a trace, for the tool: it finds the points that will not be measured before the program runs,
+// and makes a copy for a service that cannot read the file.
 #pragma once
 
 #include "tracing/TraceParams.h"
@@ -10,23 +10,25 @@
 #include <vector>
 
 struct TraceParametersFile {
-    std::filesystem::path path; // absolute, for the service has another directory
+    std::filesystem::path path; // absolute, because the service has another current directory
     std::string text;
-    TraceParams params; // as the service understands it
+    TraceParams params; // as the service reads it
 };
 
-// Throws std::runtime_error when it cannot be read, is no property list, or asks for what this service never measures.
+// Throws std::runtime_error if the file cannot be read, is not a property list, or asks for a kind of trace that the
+// service does not support.
 [[nodiscard]] TraceParametersFile readTraceParameters(const std::filesystem::path& path);
 
-// What will be measured otherwise than the file says, or not at all: a line each.
+// A line for each point that will be measured differently from the file, or not at all.
 [[nodiscard]] std::vector<std::string> warningsOf(const TraceParams& params);
 
-// A copy that the service can read, whatever it may see of the file itself. It lies where the service writes its
-// results: that it can reach, and everybody may write there who may read the results. It lasts as long as this object.
+// A copy that the service can read, even if it cannot read the file itself. It is in the service's folder of results:
+// the service can reach it, and all users who may read the results may write there. The copy lasts as long as this
+// object.
 class TraceParametersCopy {
 public:
-    // In the folder, which is at or below the root; from there on no link is followed, for others write there, too.
-    // Throws std::runtime_error when it cannot be made.
+    // Makes the copy in the folder, which is at or below the root. Below the root it does not follow links, because
+    // other users may write there, too. Throws std::runtime_error on failure.
     TraceParametersCopy(const std::filesystem::path& root, const std::filesystem::path& folder, std::string_view text);
     ~TraceParametersCopy();
     TraceParametersCopy(const TraceParametersCopy&) = delete;

@@ -1,5 +1,5 @@
-// Nothing is run before it is known that it can be measured: the service first traces for a moment, and what it writes
-// then tells whether it reads the parameters, where its results come, and whether they can be read.
+// The program runs only after a check that it can be measured: the service first traces for a moment, and its results
+// show whether it can read the parameters, where its results are, and whether the tool can read them.
 #include "kesto/trace/TraceRecording.h"
 
 #include "kesto/Commands.h"
@@ -27,7 +27,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// Where the service writes, and from where on others may, too.
+// The folder of the results, and the root below which other users may write, too.
 struct ResultsFolder {
     fs::path root;
     fs::path path;
@@ -41,7 +41,7 @@ ResultsFolder folderOf(const TraceRecordingOptions& options)
     return {.root = usualLogsDirectory(), .path = usualLogsDirectory() / "Audio/Traces"};
 }
 
-// What the service says is wrong when it traces for a moment with the parameters that it finds at that path.
+// The problem that the service reports when it traces for a moment with the parameters at that path.
 std::string problemWith(const fs::path& parameters, TracedSession& session, TraceResultsPlace& results)
 {
     session.start(parameters);
@@ -49,7 +49,8 @@ std::string problemWith(const fs::path& parameters, TracedSession& session, Trac
     return traceResultsOf(results.takeNew(), results.path()).problem;
 }
 
-// Begins the trace. What is wrong in the file itself was told before; what the service says beyond that ends it.
+// Starts the trace. Errors in the file itself were reported before; any other problem of the service ends the
+// recording.
 void start(TracedSession& session, const TraceParametersFile& file, TraceResultsPlace& results,
            const ResultsFolder& folder)
 {
@@ -67,10 +68,10 @@ void start(TracedSession& session, const TraceParametersFile& file, TraceResults
     if (const std::string other = problemWith(copy->path(), session, results); other != file.params.problem)
         throw std::runtime_error(
             fmt::format("the service does not measure by {}: {}", printable(file.path.native()), printable(other)));
-    session.start(copy->path()); // which it has read when this returns
+    session.start(copy->path()); // the service has read the copy when this returns
 }
 
-// While a program runs in front, the keys that interrupt are for it: who waits for it goes on, as a shell does.
+// While a program runs in the foreground, keyboard signals are for the program: the tool ignores them, as a shell does.
 class KeyboardSignals {
 public:
     KeyboardSignals()
@@ -88,7 +89,7 @@ public:
     KeyboardSignals(const KeyboardSignals&) = delete;
     KeyboardSignals& operator=(const KeyboardSignals&) = delete;
 
-    // Those that the program is to have as they were before.
+    // The signals that the program must handle as before.
     [[nodiscard]] sigset_t handledBefore() const
     {
         sigset_t signals;
@@ -123,7 +124,7 @@ int spawn(std::vector<std::string> command, const KeyboardSignals& signals, pid_
     return error;
 }
 
-// Runs the program to its end and returns its exit status; nothing when it cannot be run, which is told.
+// Runs the program to its end and returns its exit status; if it cannot run, prints the reason and returns nothing.
 std::optional<int> run(const std::vector<std::string>& command)
 {
     constexpr int signalled = 128;
@@ -144,7 +145,7 @@ void tell(const std::exception& exception)
     fmt::print(stderr, "kesto: {}\n", exception.what());
 }
 
-// The exit status, if the program's own is that all is well.
+// Returns the exit status for a program that succeeded.
 int show(TraceResultsPlace& results, const fs::path& output)
 {
     const std::string text = results.takeNew();
@@ -152,7 +153,7 @@ int show(TraceResultsPlace& results, const fs::path& output)
     try {
         if (!output.empty())
             writeOutput(output, text);
-    } catch (const std::exception& exception) { // what was measured is there to be seen all the same
+    } catch (const std::exception& exception) { // the results are shown all the same
         tell(exception);
         status = exitFailure;
     }
@@ -164,14 +165,14 @@ int show(TraceResultsPlace& results, const fs::path& output)
 
 int recordTrace(const TraceRecordingOptions& options)
 {
-    constexpr int exitCannotRun = 127; // as shells have it
+    constexpr int exitCannotRun = 127; // as in shells
     const TraceParametersFile parameters = readTraceParameters(options.parameters);
     for (const std::string& warning : warningsOf(parameters.params))
         fmt::print(stderr, "kesto: warning: {}: {}\n", printable(parameters.path.native()), printable(warning));
     const ResultsFolder folder = folderOf(options);
     TraceResultsPlace results(options.results.empty() ? folder.path / "tracing_results.qdj" : options.results);
     if (!options.socket.empty())
-        ::setenv("KESTO_SOCKET", options.socket.c_str(), 1); // before there are threads
+        ::setenv("KESTO_SOCKET", options.socket.c_str(), 1); // before threads start
     TracedSession session(options.socket);
     start(session, parameters, results, folder);
     const auto ended = run(options.command);

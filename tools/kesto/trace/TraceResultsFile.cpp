@@ -1,4 +1,4 @@
-// A file may hold millions of records, so they are not made values first: the parser's calls fill the series.
+// A file may hold millions of records, so the parser's events fill the series directly, without values in between.
 #include "kesto/trace/TraceResultsFile.h"
 
 #include <fmt/format.h>
@@ -11,11 +11,11 @@
 
 namespace {
 
-constexpr unsigned deepest = 32; // of what is passed over
+constexpr unsigned deepest = 32; // of ignored members
 constexpr unsigned parseFlags =
     rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag | rapidjson::kParseFullPrecisionFlag;
 
-// What RapidJSON's reader tells. Members that the format does not have are passed over, whatever they hold.
+// Receives RapidJSON's events. Unknown members are ignored.
 class ResultsBuilder {
 public:
     bool Null() { return scalar({.kind = Kind::Null}); }
@@ -68,9 +68,9 @@ public:
         return true;
     }
 
-    // What was wrong when parsing ended early.
+    // The error if parsing ended early.
     [[nodiscard]] const std::string& problem() const { return problem_; }
-    // When all was parsed.
+    // The result after the whole text was parsed.
     [[nodiscard]] std::expected<TraceResultsFile, std::string> finish()
     {
         for (const auto& [isThere, key] :
@@ -117,7 +117,7 @@ private:
 
     bool enter() { return ++depth_ <= deepest || fail("it is nested too deep"); }
 
-    // Whether the member at this place may hold others: not those of the format.
+    // Whether the member at this place may be a container: only an unknown member may.
     bool mayBeContainer()
     {
         if (isInRecords_ && depth_ == inRecord && (key_ == "name" || key_ == "value" || key_ == "unit"))
@@ -151,11 +151,11 @@ private:
         else if (double* const loss = lossAt(key_); loss != nullptr && value.kind == Kind::Number)
             *loss = value.number;
         else
-            return mayBeContainer(); // no member of the format, that is
+            return mayBeContainer(); // an unknown member
         return true;
     }
 
-    // Null for what is none.
+    // The count of that name; null for other keys.
     double* lossAt(std::string_view key)
     {
         for (const auto& [name, loss] : {std::pair("lostEvents", &file_.lostEvents),

@@ -1,4 +1,4 @@
-// A file is told from another by what it is, not by when it was written: clocks are coarser than traces are short.
+// Files are distinguished by their identity and not by their times, because clocks are too coarse for short traces.
 #include "kesto/trace/TraceResultsPlace.h"
 
 #include "kesto/Terminal.h"

@@ -1,4 +1,4 @@
-// Where the service writes the results of traces, and what has come there since somebody last looked.
+// The place of the service's results, which reports new results since the last check.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -8,7 +8,8 @@
 
 class TraceResultsPlace {
 public:
-    // What is there now is not new. Throws std::runtime_error, which gives the reason, when that cannot be found out.
+    // A file that exists already does not count as new. Throws std::runtime_error, which gives the reason, if this
+    // cannot be checked.
     explicit TraceResultsPlace(std::filesystem::path path);
 
     [[nodiscard]] const std::filesystem::path& path() const { return path_; }
@@ -20,5 +21,5 @@ private:
     [[nodiscard]] platform::FileDescriptor look() const;
 
     const std::filesystem::path path_;
-    platform::FileDescriptor last_; // kept open, so that no file that comes later can be taken for it; may be none
+    platform::FileDescriptor last_; // kept open, so that a later file cannot have the same identity; may be empty
 };

@@ -1,4 +1,4 @@
-// Ranks in the sorted values, and boundaries that a person likes to read.
+// Computes percentiles by rank in the sorted values, and boundaries with round numbers.
 #include "kesto/trace/TraceStatistics.h"
 
 #include <algorithm>
@@ -40,12 +40,12 @@ std::vector<HistogramRow> traceHistogram(std::span<const double> values)
     const double least = values.front();
     const double most = values.back();
     const double fence = percentile(values, 90) + (percentile(values, 90) - least);
-    // When nearly all are the same, the rows have to reach to the others.
+    // If nearly all values are equal, the rows must reach to the others.
     const double end = fence > least ? *std::prev(std::ranges::upper_bound(values, fence)) : most;
     const double width = roundedUp((end - least) / wantedRows);
     const double first = std::floor(least / width) * width;
     const double farthest = std::max(std::abs(first), std::abs(end));
-    if (!std::isnormal(width) || !std::isfinite(farthest) || farthest + width == farthest) // nothing tells them apart
+    if (!std::isnormal(width) || !std::isfinite(farthest) || farthest + width == farthest) // rows cannot differ
         return {{.lower = least, .upper = most, .count = values.size()}};
 
     std::vector<HistogramRow> rows;

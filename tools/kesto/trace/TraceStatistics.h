@@ -1,11 +1,11 @@
-// What a list of measured values is like: how they lie, as a few numbers and as a histogram.
+// Describes a list of measured values by a few numbers and a histogram.
 #pragma once
 
 #include <cstddef>
 #include <span>
 #include <vector>
 
-// Each of them is a value that was measured. A percentile is the least value that so many percent of all do not exceed.
+// Each is a measured value. A percentile is the least value that this percentage of all values does not exceed.
 struct TraceStatistics {
     double minimum = 0;
     double median = 0;
@@ -14,17 +14,17 @@ struct TraceStatistics {
     double maximum = 0;
 };
 
-// How many values lie from `lower` on and below `upper`; in the last row, up to `upper`.
+// The number of values from `lower` up to, but not including, `upper`; the last row includes `upper`.
 struct HistogramRow {
     double lower = 0;
     double upper = 0;
     std::size_t count = 0;
 };
 
-// Of values in ascending order; at least one, none of them infinite or not a number.
+// For at least one value, in ascending order, without infinity and NaN.
 [[nodiscard]] TraceStatistics traceStatistics(std::span<const double> values);
 
-// Rows of one width, which is a round number (1, 2 or 5 and zeros), from the least value on. What is further above the
-// 90th percentile than the least value is below it, is in one more row: it may be very far.
+// Rows of one width, which is a round number (1, 2 or 5 and zeros), from the least value on. Values that are farther
+// above the 90th percentile than the least value is below it are in one more row.
 [[nodiscard]] std::vector<HistogramRow> traceHistogram(std::span<const double> values);
 constexpr std::size_t mostHistogramRows = 13;

@@ -1,4 +1,4 @@
-// Times are shown in the unit that suits them, with four digits: enough to compare, few enough to read.
+// Times have a suitable unit and four digits: enough to compare, few enough to read.
 #include "kesto/trace/TraceView.h"
 
 #include "foundation/values/Json.h"
@@ -20,7 +20,7 @@ using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
 
-// A sentence each.
+// A sentence for each kind of missing data.
 std::vector<std::string> whatIsMissing(const TraceResultsFile& results)
 {
     std::vector<std::string> sentences;
@@ -64,7 +64,7 @@ std::string numberText(double number, std::string_view unit)
     return fmt::format("{:.4g} {}", number / scale.size, printable(scale.unit));
 }
 
-// Of rows of that width: all in one unit, with as many digits as tell them apart.
+// The boundary of a row of that width: all rows have one unit, and enough digits to differ.
 std::string boundaryText(double number, double width, double scale)
 {
     constexpr double longest = 1e12;
@@ -109,7 +109,7 @@ void printTable(const TraceResultsFile& results, std::size_t width)
     }
 }
 
-// As much of the columns as the count is of the most; something for any but none.
+// A bar whose part of the columns is the count's part of `most`; never empty for a count above 0.
 std::string barText(std::size_t count, std::size_t most, std::size_t columns)
 {
     constexpr std::array<std::string_view, 8> parts{"", "▏", "▎", "▍", "▌", "▋", "▊", "▉"};
@@ -193,7 +193,7 @@ TraceResultsFile traceResultsOf(std::string_view text, const std::filesystem::pa
     auto results = parseTraceResults(text);
     if (!results)
         throw std::runtime_error(
-            fmt::format("{} is no results file of a trace: {}", printable(path.native()), results.error()));
+            fmt::format("{} is not a results file of a trace: {}", printable(path.native()), results.error()));
     for (TraceSeries& series : results->series)
         std::ranges::sort(series.values);
     return *std::move(results);

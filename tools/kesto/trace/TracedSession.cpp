@@ -1,4 +1,4 @@
-// The library calls back on a thread of its own; each step waits until it has.
+// The library calls back on a thread of its own; each step waits for this callback.
 #include "kesto/trace/TracedSession.h"
 
 #include "kesto/Terminal.h"
@@ -12,8 +12,8 @@
 
 namespace {
 
-constexpr std::chrono::seconds patience{30}; // until an answer
-constexpr std::chrono::seconds tracePatience{2}; // until a trace that was started is seen here
+constexpr std::chrono::seconds patience{30}; // how long to wait for an answer
+constexpr std::chrono::seconds tracePatience{2}; // how long to wait until a started trace becomes visible
 
 template <typename... Arguments> [[noreturn]] void fail(fmt::format_string<Arguments...> text, Arguments&&... arguments)
 {
@@ -43,15 +43,15 @@ TracedSession::TracedSession(const std::string& socket) : reporter_(randomReport
 
 void TracedSession::start(const std::filesystem::path& parameters)
 {
-    // The kind of trace is left out: the service knows one, and takes no client's word for it.
+    // The configuration leaves out the kind of trace: the service has one kind, and refuses a kind from a client.
     kesto::Message configuration;
     configuration.add("KestoReportingPellorinPlistFilePath", parameters.native());
     ask([&](const auto& answered) { return client_.setConfiguration(configuration, reporter_, answered); });
     {
         const std::scoped_lock lock(lock_);
-        mayBeTraced_ = false; // the last start was answered once more when it was stopped
+        mayBeTraced_ = false; // the last start got its second answer when it was stopped
     }
-    // Where the service may trace, a start is answered before the next call; else it is answered when it ends.
+    // If the service may trace, a start is answered before the next call; else when the session stops.
     if (const auto status = client_.startSession(reporter_, [this](const auto& answer) { takeStart(answer); });
         status != kesto::Status::Ok)
         fail("the session cannot be started: {}", kesto::errorText(status));
@@ -60,7 +60,7 @@ void TracedSession::start(const std::filesystem::path& parameters)
         const std::scoped_lock lock(lock_);
         if (!mayBeTraced_)
             fail("the service does not trace. Either the feature is off (feature-flags.toml: [Sonalis] Tracing = "
-                 "true), or there is no tracefs that it may use: its log says so");
+                 "true), or it may not use tracefs: its log gives the reason");
     }
     waitForTrace();
 }
@@ -77,7 +77,7 @@ void TracedSession::ask(const Call& call)
         isAnswered_ = false;
     }
     if (const auto status = call([this](const kesto::Answer& answer) { take(answer); });
-        status != kesto::Status::Ok && status != kesto::Status::NotConnected) // what is lost is told below
+        status != kesto::Status::Ok && status != kesto::Status::NotConnected) // a lost connection is reported below
         fail("the service cannot be asked: {}", kesto::errorText(status));
     std::unique_lock lock(lock_);
     if (!changed_.wait_for(lock, patience, [this] { return isAnswered_ || !problem_.empty(); }))
@@ -96,7 +96,7 @@ void TracedSession::waitForTrace()
             throw std::runtime_error(problem_);
         if (std::chrono::steady_clock::now() > end)
             fail("the service has begun no trace: its log says why");
-        changed_.wait_for(lock, std::chrono::milliseconds(1)); // nobody tells when it begins
+        changed_.wait_for(lock, std::chrono::milliseconds(1)); // the library does not report its beginning
     }
 }
 
@@ -104,7 +104,7 @@ void TracedSession::take(const kesto::Answer& answer)
 {
     const std::scoped_lock lock(lock_);
     if (answer.status() != kesto::Status::Ok)
-        return; // the library's, of a connection whose end is told apart
+        return; // the library's error for a lost connection, which is reported separately
     isAnswered_ = true;
     if (!answer.ok())
         problem_ = fmt::format("the service refuses: {} {}; is reporting disabled?", printable(answer.errorDomain()),

@@ -1,8 +1,8 @@
-// A session of the service that traces from `start` to `stop`, as often as one likes; it ends with its connection at
-// the latest.
+// A session of the service that traces from `start` to `stop`, any number of times; it ends with its connection at the
+// latest.
 //
-// That the service traces shows twice: a start is answered at once, and a client that asked for it may emit events.
-// Whoever is refused on the way is told where to look.
+// Two signs show that the service traces: it answers a start at once, and a client that asked may emit events. If the
+// service refuses, the error says where to look.
 #pragma once
 
 #include <condition_variable>
@@ -12,13 +12,13 @@
 #include <mutex>
 #include <string>
 
-// One thread. Everything throws std::runtime_error, with a line for a person, when it cannot be done.
+// One thread. Every function throws std::runtime_error, with a line for a person, on failure.
 class TracedSession {
 public:
     // An empty socket stands for the service's usual place.
     explicit TracedSession(const std::string& socket);
 
-    // When it returns, the service has read the parameters and traces, as far as can be seen here.
+    // When it returns, the service has read the parameters and, as far as a client can see, traces.
     void start(const std::filesystem::path& parameters);
     // When it returns, the service has written the results, if it could.
     void stop();
@@ -39,5 +39,5 @@ private:
     bool isAnswered_ = false; // the last call
     bool mayBeTraced_ = false; // the start was answered at once
     std::string problem_;
-    kesto::Client client_; // ends first: its thread calls what is above
+    kesto::Client client_; // destroyed first: its thread uses the members above
 };

@@ -1,5 +1,5 @@
-// Everything is done from the open folder by names in it, and what comes or goes does so under a hidden name:
-// whenever the service is killed, a capture is whole or it is not there.
+// All steps use names in the open folder, and captures are made and removed under hidden names: even if the service is
+// killed, a capture is complete or does not exist.
 #include "platform/linux/bugs/BugCaptureFolder.h"
 
 #include "platform/linux/files/FilesAt.h"
@@ -26,7 +26,7 @@ namespace {
 constexpr const char* folderName = "bug-captures";
 constexpr const char* lastNumberName = "bug-captures.last"; // beside the folder, which people may remove
 constexpr const char* stateName = "state";
-constexpr mode_t permissions = 0750; // of folders: what a capture holds is for the service's group
+constexpr mode_t permissions = 0750; // of folders: only the service's user and group may read captures
 
 constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
 
@@ -34,7 +34,7 @@ constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
 constexpr std::string_view coming = ".new";
 constexpr std::string_view going = ".old";
 
-// The number that the text begins with, if that character follows it; else 0. There is a number after each.
+// The number at the start of the text if that character follows it and a next number exists; else 0.
 std::uint64_t numberBefore(char end, std::string_view text)
 {
     std::uint64_t number = 0;
@@ -43,7 +43,7 @@ std::uint64_t numberBefore(char end, std::string_view text)
     return isNumber && number < std::numeric_limits<std::uint64_t>::max() ? number : 0;
 }
 
-// Of a capture; 0 for names of other things.
+// The number of a capture; 0 for other names.
 std::uint64_t numberOf(std::string_view name)
 {
     return numberBefore('-', name);
@@ -60,13 +60,13 @@ std::string utcText(double time)
     return {text.data(), std::strftime(text.data(), text.size(), "%Y%m%dT%H%M%SZ", &parts)};
 }
 
-// Takes something out of sight at once, and then away.
+// Hides the folder in one step, and then removes it.
 void remove(int directory, const std::string& name, int folder)
 {
     const std::string hidden(going);
     removeTreeAt(folder, hidden); // of an attempt that failed
     if (::renameat(directory, name.c_str(), folder, hidden.c_str()) == 0)
-        removeTreeAt(folder, hidden); // what stays is removed at the next start
+        removeTreeAt(folder, hidden); // the next start removes the rest
 }
 
 std::error_code syncDirectory(int directory)
@@ -91,7 +91,7 @@ std::expected<FileDescriptor, std::error_code> makeDirectoryAt(int directory, co
 
 } // namespace
 
-// As the disk shows it.
+// A capture on the disk.
 struct BugCaptureFolder::Capture {
     std::uint64_t number;
     std::string name;
@@ -107,7 +107,7 @@ BugCaptureFolder::BugCaptureFolder(std::filesystem::path stateDirectory, Limits 
         removeLeftovers(folder->get());
 }
 
-// The state directory may be a link: it is the administrator's. What is in it is the service's own.
+// The state directory may be a link, because the administrator made it. Its content is the service's own.
 std::expected<FileDescriptor, std::error_code> BugCaptureFolder::openStateDirectory() const
 {
     FileDescriptor opened(::open(stateDirectory_.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
@@ -166,7 +166,7 @@ std::vector<BugCaptureFolder::Capture> BugCaptureFolder::capturesIn(int folder)
     return captures;
 }
 
-// 0 when none was kept.
+// 0 if no number was kept.
 std::uint64_t BugCaptureFolder::lastNumber() const
 {
     constexpr std::size_t longest = 32;
@@ -181,7 +181,7 @@ std::error_code BugCaptureFolder::keepLastNumber(std::uint64_t number) const
     if (!parent)
         return parent.error();
     const std::string unfinished = std::string(lastNumberName) + ".new";
-    removeTreeAt(parent->get(), unfinished); // of a service that was killed
+    removeTreeAt(parent->get(), unfinished); // left by a killed service
     if (const auto error = writeFileAt(parent->get(), unfinished, fmt::format("{}\n", number)))
         return error;
     if (::renameat(parent->get(), unfinished.c_str(), parent->get(), lastNumberName) == 0)
@@ -205,7 +205,7 @@ std::expected<std::string, std::error_code> BugCaptureFolder::nextName(double ti
     return fmt::format("{:08}-{}", highest + 1, utcText(time));
 }
 
-// For one capture more, with so many bytes of bulk.
+// Makes room for one more capture, with so many bytes of state.
 void BugCaptureFolder::makeRoom(int folder, std::uint64_t bytes) const
 {
     const std::vector<Capture> captures = capturesIn(folder);

@@ -1,15 +1,15 @@
-// The folder of captured bugs on the disk: a folder a capture, numbered from 1 and never again.
+// The folder of captured bugs on the disk: a folder for each capture, numbered from 1; no number is used again.
 //
 //     bug-captures/
 //         00000007-20260131T180000Z/
-//             signature.json      what was seen, and where
-//             response.json       what whoever asked was told
-//             state/              how the device was: the bulk
-//     bug-captures.last           the last number that was used, whatever has been removed since
+//             signature.json      which bug was seen, and where
+//             response.json       the response to the request
+//             state/              the state of the device: nearly all bytes ("bulk")
+//     bug-captures.last           the last used number, even if its capture was removed
 //
-// A capture appears as a whole, by one rename of a hidden folder, and so does its bulk go when room is needed, the
-// oldest first. What stays is its tombstone: that this was seen, when, and how often. What hidden folders are left by a
-// service that was killed are removed at the next start.
+// A capture appears completely, by one rename of a hidden folder. When room is needed, the bulk of the oldest captures
+// is removed in the same way, and the rest stays as a tombstone: the bug and its time. At its start the service removes
+// hidden folders that a killed service left.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -28,10 +28,10 @@ namespace platform {
 class BugCaptureFolder {
 public:
     struct Limits {
-        std::size_t mostCaptures = 1000; // tombstones too; beyond it the oldest go altogether
+        std::size_t mostCaptures = 1000; // tombstones too; beyond it the oldest are removed completely
         std::size_t mostWithBulk = 50;
         std::uint64_t mostBytes = std::uint64_t{32} * 1024 * 1024; // of all bulk
-        std::uint64_t bytesLeftFree = std::uint64_t{64} * 1024 * 1024; // on the file system, for everybody else
+        std::uint64_t bytesLeftFree = std::uint64_t{64} * 1024 * 1024; // on the file system, for other programs
     };
 
     // One file of a capture.
@@ -40,8 +40,8 @@ public:
         std::string text;
     };
 
-    // Removes what a killed service left. The folder is `bug-captures` in the state directory; it is made with the
-    // first capture.
+    // Removes the hidden folders of a killed service. The folder is `bug-captures` in the state directory; it is made
+    // with the first capture.
     BugCaptureFolder(std::filesystem::path stateDirectory, Limits limits);
     explicit BugCaptureFolder(std::filesystem::path stateDirectory)
         : BugCaptureFolder(std::move(stateDirectory), Limits())
@@ -50,14 +50,13 @@ public:
 
     [[nodiscard]] const std::filesystem::path& path() const noexcept { return path_; }
 
-    // Whether the file system has so much room that a capture may be taken; `errc::no_space_on_device` if not.
+    // Checks that the file system has enough room for a capture; `errc::no_space_on_device` if not.
     [[nodiscard]] std::error_code checkFreeSpace() const;
 
-    // The name that the next capture is going to have, at that moment: seconds since 1970.
+    // The name of the next capture at that time, in seconds since 1970.
     [[nodiscard]] std::expected<std::string, std::error_code> nextName(double time) const;
 
-    // Adds a capture of that name, having made room for it. When `state` alone is more than may be kept, it is left
-    // out.
+    // Makes room and adds a capture of that name. If `state` alone exceeds the limit, it is left out.
     [[nodiscard]] std::error_code add(const std::string& name, const std::vector<File>& files,
                                       const std::vector<File>& state);
 

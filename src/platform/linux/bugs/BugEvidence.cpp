@@ -1,5 +1,4 @@
-// Reading /proc as what it is: files that lie about their size, vanish while they are read, and hold what strangers
-// chose to call themselves.
+// Files of /proc report a wrong size, may vanish while they are read, and hold names that foreign processes chose.
 #include "platform/linux/bugs/BugEvidence.h"
 
 #include "foundation/values/String.h"
@@ -25,7 +24,7 @@ constexpr std::size_t longestName = 64; // of kernel threads; processes have at 
 constexpr unsigned deepestSoundFolder = 6;
 constexpr std::size_t mostNames = std::size_t{1} << 20; // in a folder of the kernel's
 
-// The parts that end with such a byte, as text; a last one without it counts too.
+// The parts that end with that byte, as text; a last part without it counts too.
 Array partsOf(std::string bytes, char end)
 {
     foundation::replaceWhatIsNotUtf8(bytes);
@@ -54,7 +53,7 @@ Dictionary describeProcess(std::int64_t number, int process, const BugEvidenceLi
     Dictionary::Entries entries{{"pid", number}};
     for (const char* file : {"status", "stat", "cmdline", "wchan", "limits"}) {
         auto bytes = readFileAt(process, file, limits.longestProcessFile);
-        if (!bytes) // it ended, or does not show this to us
+        if (!bytes) // the process ended, or this file is not readable
             entries.push_back({file, Value()});
         else
             entries.push_back({file, partsOf(*std::move(bytes), std::string_view(file) == "cmdline" ? '\0' : '\n')});
@@ -75,7 +74,7 @@ std::vector<std::int64_t> processNumbers(int proc)
     return numbers;
 }
 
-// The files of a folder and of those in it, until a limit is met.
+// The files of a folder and of its subfolders, up to a limit.
 class SoundFiles {
 public:
     explicit SoundFiles(const BugEvidenceLimits& limits) : limits_(limits), bytesLeft_(limits.mostSoundBytes) { }

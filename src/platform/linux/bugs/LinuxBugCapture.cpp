@@ -1,5 +1,5 @@
-// What must be told as it was when the bug was seen is gathered by whoever asks; what waits for the disk and for
-// /proc is left to the background queue.
+// The requesting thread collects the state at the moment of the bug; the background queue reads /proc and writes to the
+// disk, which may block.
 #include "platform/linux/bugs/LinuxBugCapture.h"
 
 #include "foundation/text/PrettyJsonWriter.h"
@@ -16,7 +16,7 @@ namespace {
 using foundation::Dictionary;
 using foundation::Value;
 
-// For people and for machines. What JSON cannot say is said as text.
+// JSON for people and programs. Numbers that JSON cannot express become text.
 std::string jsonOf(const Value& value)
 {
     std::string json;
@@ -71,7 +71,7 @@ std::uint64_t LinuxBugCapture::refusedSnapshots() const
     return refused_;
 }
 
-// Whether a snapshot may be taken now; counts it, or its refusal.
+// Whether a snapshot may be taken now; counts the snapshot or the refusal.
 bool LinuxBugCapture::admit()
 {
     const double now = sources_.clock.systemUptime();
@@ -103,7 +103,7 @@ void LinuxBugCapture::submit(Request request)
         queue.submit([this] { takeNext(); });
 }
 
-// One snapshot an item, so that other work of the queue gets its turn.
+// Takes one snapshot in each item, so that other items of the queue run in between.
 void LinuxBugCapture::takeNext()
 {
     Request request;
@@ -136,7 +136,7 @@ Dictionary LinuxBugCapture::responseOf(std::string_view name) const
     return {{"success", true}, {"snapshot", name}, {"directory", (folder_.path() / name).native()}};
 }
 
-// The name of the snapshot, or why there is none.
+// The name of the snapshot, or the reason why it failed.
 std::expected<std::string, std::string> LinuxBugCapture::write(const Request& request)
 {
     if (const auto error = folder_.checkFreeSpace())

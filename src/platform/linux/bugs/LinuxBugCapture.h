@@ -1,15 +1,14 @@
-// The room of bugs: snapshots of what can be known when something goes wrong. It reads /proc and writes below the
-// directory of captures.
+// The room of bugs: snapshots of the evidence of a bug. It reads /proc and writes below the directory of captures.
 //
-// The bug-capture service: a folder a snapshot, below the state directory, for whoever looks into it later.
+// The bug-capture service: a folder for each snapshot, below the state directory, for later inspection.
 //
-// A snapshot holds what the service said last and which sessions it had, what the kernel tells of the process in which
-// the bug was seen, and the state of the sound system. It is taken in the background, one at a time: whoever asks, asks
-// and goes on.
+// A snapshot holds the service's last log lines and its sessions, the kernel's information about the process that
+// showed the bug, and the state of the sound system. Snapshots are taken in the background, one at a time: a caller
+// does not wait.
 //
-// What leads to a snapshot is a client's message. So a client can ask for as many as it likes, and every one would push
-// out an older one that somebody needs: beyond a few in a while no more are taken, and the next that is taken tells how
-// many were not.
+// A client's message causes a snapshot. So a client could cause any number, and each would displace an older one that a
+// developer needs. Therefore only a few are taken in a period, and the next snapshot after it holds the number of
+// refusals.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -40,15 +39,15 @@ public:
         BugCaptureFolder::Limits folder = {};
     };
 
-    // Whom it asks; all of them outlive it.
+    // The providers that it uses; all must outlive it.
     struct Sources {
         const RecentLogLines& log;
         const Clock& clock;
         WorkQueues& workQueues;
-        std::filesystem::path proc = "/proc"; // where the kernel shows processes and the sound system
+        std::filesystem::path proc = "/proc"; // processes and the sound system
     };
 
-    // Writes below the state directory. Snapshots that a killed service did not finish are removed at once.
+    // Writes below the state directory. Removes the unfinished snapshots of a killed service at once.
     LinuxBugCapture(const std::filesystem::path& stateDirectory, Sources sources, ProviderLog log,
                     const Limits& limits);
     LinuxBugCapture(const std::filesystem::path& stateDirectory, Sources sources, ProviderLog log)
@@ -59,7 +58,7 @@ public:
     [[nodiscard]] std::unique_ptr<BugCaptureReporter> makeReporter() override;
     void setStateDescription(const StateDescription& describe) override { describeState_ = describe; }
 
-    // That were asked for too soon after others, since the start.
+    // How many requests were refused since the start, because they came too soon after others.
     [[nodiscard]] std::uint64_t refusedSnapshots() const;
 
 private:
@@ -70,14 +69,14 @@ private:
         foundation::Value event;
         foundation::Value payload;
         BugCaptureReporter::Reply reply;
-        std::int32_t sender = 0; // whose message led to it; 0 when that is not known
-        foundation::Value state = {}; // of whoever asks
+        std::int32_t sender = 0; // the process whose message caused it; 0 if unknown
+        foundation::Value state = {}; // of the requesting program
     };
 
     void submit(Request request);
     [[nodiscard]] bool admit();
 
-    // The background queue.
+    // On the background queue.
     void takeNext();
     [[nodiscard]] foundation::Dictionary capture(const Request& request);
     [[nodiscard]] std::expected<std::string, std::string> write(const Request& request);
@@ -87,13 +86,13 @@ private:
     const Sources sources_;
     const ProviderLog log_;
     const Limits limits_;
-    BugCaptureFolder folder_; // the background queue's, one item at a time
+    BugCaptureFolder folder_; // used on the background queue, one item at a time
     StateDescription describeState_;
 
     mutable foundation::Mutex lock_;
     std::deque<Request> waiting_ KESTO_GUARDED_BY(lock_);
     bool isTaking_ KESTO_GUARDED_BY(lock_) = false;
-    std::deque<double> admitted_ KESTO_GUARDED_BY(lock_); // when the last ones were, by the system's uptime
+    std::deque<double> admitted_ KESTO_GUARDED_BY(lock_); // the uptimes of the last accepted requests
     std::uint64_t refused_ KESTO_GUARDED_BY(lock_) = 0;
 };
 

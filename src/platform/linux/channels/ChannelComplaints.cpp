@@ -1,4 +1,4 @@
-// Problems are kept sorted, so that to look one up is cheap however many there are.
+// Problems are sorted, so that a look-up is cheap among many.
 #include "platform/linux/channels/ChannelComplaints.h"
 
 #include "platform/linux/files/SystemError.h"

@@ -1,8 +1,6 @@
-// What is wrong in the channel tree, said once, however many questions meet it and however often they are asked.
-//
-// The service asks one tree several questions, and most of what is wrong in it meets all of them. So every question
-// remembers what its last look found, and only that is said which none of them remembers. What was right in between is
-// said again.
+// Logs each problem of the channel tree once, even if several queries find it repeatedly. The service reads one tree
+// with several queries, and most problems concern all of them. So every query keeps the problems that it found last,
+// and only a problem that no query has kept is logged. A problem that disappeared in between is logged again.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -18,16 +16,16 @@ namespace platform {
 // Any thread.
 class ChannelComplaints {
 public:
-    // How many of the channels that are missing are named at once; the rest is counted.
+    // How many missing channels are named at once; the others are counted.
     static constexpr std::size_t mostNamed = 16;
 
-    // What a look found.
+    // The result of one reading.
     struct Findings {
         std::vector<ChannelProblem> problems = {};
         LeftOutChannels leftOut = {};
-        std::error_code error = {}; // why the tree could not be looked at
+        std::error_code error = {}; // why the tree could not be read
     };
-    // Of one question. Whoever asks it keeps this as long as it may be asked again.
+    // The last findings of one query. Its owner keeps it as long as the query may be repeated.
     using Memory = std::shared_ptr<Findings>;
 
     ChannelComplaints(std::filesystem::path root, const ChannelTree::Limits& limits, ProviderLog log)
@@ -38,11 +36,11 @@ public:
     }
 
     [[nodiscard]] Memory addQuestion();
-    // Says what is new in what was found, and remembers it.
+    // Logs the new findings, and keeps all.
     void tell(Findings found, const Memory& memory);
-    // The tree could not be looked at: what was wrong in it is remembered until it can.
+    // Logs that the tree could not be read, and keeps its earlier findings until it can be read.
     void tellUnreadable(std::error_code error, const Memory& memory);
-    // Forgets what questions found that nobody keeps any more.
+    // Forgets the findings of queries whose owners are gone.
     void forgetDroppedQuestions();
 
 private:

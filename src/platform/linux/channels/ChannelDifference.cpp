@@ -1,5 +1,5 @@
-// First whether a channel went on counting, as a whole, then the subtraction: no counter is compared on its own, so
-// that of a channel that was reset none is subtracted.
+// First decides for a whole channel whether it went on counting, and then subtracts: so no counter of a reset channel
+// is subtracted.
 #include "platform/linux/channels/ChannelDifference.h"
 
 #include <algorithm>
@@ -19,7 +19,7 @@ auto identityAt(const ReportingChannel* channel)
     return identityOf(*channel);
 }
 
-// Looks channels up by what they are called.
+// Finds channels by their names.
 class Index {
 public:
     explicit Index(const std::vector<ReportingChannel>& channels)
@@ -40,7 +40,7 @@ private:
     std::vector<const ReportingChannel*> byIdentity_;
 };
 
-// Later is not less than earlier. The difference may be more than the type holds: then it is the most it holds.
+// `later` is at least `earlier`. A difference beyond the type's range becomes its greatest value.
 std::int64_t difference(std::int64_t earlier, std::int64_t later)
 {
     constexpr std::uint64_t most = std::numeric_limits<std::int64_t>::max();
@@ -50,7 +50,7 @@ std::int64_t difference(std::int64_t earlier, std::int64_t later)
 
 const StateResidency* stateNamed(const std::string& name, std::size_t place, const std::vector<StateResidency>& states)
 {
-    if (place < states.size() && states[place].name == name) // states keep their places
+    if (place < states.size() && states[place].name == name) // usually a state keeps its place
         return &states[place];
     const auto found = std::ranges::find(states, name, &StateResidency::name);
     return found == states.end() ? nullptr : &*found;

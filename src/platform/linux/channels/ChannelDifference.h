@@ -1,10 +1,10 @@
 // How channels changed from one sample to a later one.
 //
 // Values, hits, transitions and residencies are subtracted; minimum and maximum are those of the later sample, and a
-// state's duty cycle is its share of the difference's residency. Whoever publishes a channel may begin anew in between,
-// and then all its counters begin at 0: a channel in which a counter went down, a bucket has other bounds, or a state
-// is gone was reset, and its difference is what it now holds. So is that of a channel that was not there; but where
-// the earlier sample is not whole, nobody knows whether it was, and it has none.
+// state's duty cycle is its share of the difference's residency. A publisher may begin anew in between, and then all
+// its counters begin at 0: a channel was reset if a counter went down, a bucket has other bounds, or a state is
+// missing, and its difference is its whole later content. The same holds for a channel that is missing in the earlier
+// sample; but if that sample is incomplete, the channel may have existed, and it has no difference.
 #pragma once
 
 #include "platform/ReportingChannels.h"

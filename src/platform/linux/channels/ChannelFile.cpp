@@ -1,5 +1,5 @@
-// Fields are cut off the text from the left, but of a state from the right, since its name may hold blanks. A file
-// is taken as a whole or not at all.
+// The parser cuts fields off the text from the left, but those of a state from the right, because its name may hold
+// blanks. It accepts a file as a whole or not at all.
 #include "platform/linux/channels/ChannelFile.h"
 
 #include "foundation/values/String.h"
@@ -11,7 +11,7 @@
 namespace platform {
 namespace {
 
-// Takes what stands before the separator, and the separator. All that is left when there is none.
+// Takes the text before the separator, and the separator; the whole rest if the separator is missing.
 std::string_view takeUntil(char separator, std::string_view& text)
 {
     const std::size_t at = text.find(separator);
@@ -20,7 +20,7 @@ std::string_view takeUntil(char separator, std::string_view& text)
     return taken;
 }
 
-// Takes the last field of a line; the line is left without it, and empty when there was no other.
+// Takes the last field off a line, which is empty if it had only one.
 std::string_view takeLastField(std::string_view& line)
 {
     const std::size_t blank = line.rfind(' ');
@@ -40,7 +40,7 @@ bool isShare(double number)
     return std::isfinite(number) && number >= 0;
 }
 
-// Nothing when all is well.
+// Nothing on success.
 using Outcome = std::optional<ChannelFileError>;
 
 Outcome parseSimple(std::string_view lines, ReportingChannel& channel)

@@ -1,4 +1,4 @@
-// What stands in the file of one channel:
+// The content of a channel's file:
 //
 //     simple         histogram ms       state
 //     1234           3 37               Running 12 88000 0.880000
@@ -7,11 +7,11 @@
 //
 // A value; or the unit, minimum and maximum, and lower bound, upper bound and hits of every bucket; or name,
 // transitions, residency and duty cycle of every state. One blank between two fields; only the name of a state and a
-// unit may have blanks of their own. The last line ends like every other: a file that does not is not finished.
+// unit may have blanks of their own. Every line has an end, the last too: a file without it is unfinished.
 //
-// A line that names the file's owner may stand before all that (ChannelOwner.h); it has been taken off here.
+// A first line may name the file's owner (ChannelOwner.h); here it has been removed.
 //
-// Whoever may publish writes it, so nothing in it is believed before it is read in full.
+// Every user may publish, so the parser checks the whole file before it returns anything.
 #pragma once
 
 #include "platform/ReportingChannels.h"
@@ -28,17 +28,17 @@ inline constexpr std::size_t mostChannelStates = 128;
 
 enum class ChannelFileError : std::uint8_t {
     Unfinished, // it is empty, or its last line has no end
-    UnknownKind, // its first line is none of the three
-    Malformed, // a line is not what its place asks for
+    UnknownKind, // its first line names none of the three kinds
+    Malformed, // a line does not fit its place
     TooManyLines, // more buckets or states than a channel may have
     RepeatedState, // two states of the same name
     NotUtf8
 };
 
-// In words, such as "a line is malformed". A constant.
+// The text of the error, such as "a line is malformed". A constant.
 [[nodiscard]] std::string_view description(ChannelFileError error) noexcept;
 
-// A channel with what its file says; where it stands, and so what it is called, is not in it. Any thread.
+// A channel with the content of its file, without its names, which come from its path. Any thread.
 [[nodiscard]] std::expected<ReportingChannel, ChannelFileError> parseChannelFile(std::string_view text);
 
 } // namespace platform

@@ -1,4 +1,4 @@
-// An owner file is closed to everybody else before it is locked, so that nobody can be there first.
+// An owner file is not accessible to other users until it is locked, so that no other process can lock it first.
 #include "platform/linux/channels/ChannelOwner.h"
 
 #include "foundation/text/Format.h"
@@ -25,7 +25,7 @@ bool isOwner(std::string_view text)
     return text.size() == ownerDigits && text.find_first_not_of("0123456789abcdef") == std::string_view::npos;
 }
 
-// What stands between the two if it is an owner and nothing else; else empty.
+// The text between the two if it is an owner; else empty.
 std::string_view ownerBetween(std::string_view begin, std::string_view end, std::string_view text)
 {
     if (text.size() != begin.size() + ownerDigits + end.size() || !text.starts_with(begin) || !text.ends_with(end))
@@ -91,7 +91,7 @@ FileDescriptor makeChannelOwnerFile(int driverFolder, std::string_view owner)
     constexpr mode_t nobodyElse = 0200;
     constexpr mode_t everybody = 0644;
     const std::string name = channelOwnerFileName(owner);
-    ::unlinkat(driverFolder, name.c_str(), 0); // a copy that somebody made
+    ::unlinkat(driverFolder, name.c_str(), 0); // another process had made a file of that name
     FileDescriptor file(
         ::openat(driverFolder, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, nobodyElse));
     struct flock lock = wholeFile(F_WRLCK);
@@ -114,7 +114,7 @@ bool isChannelOwnerGone(int driverFolder, std::string_view owner)
         return true;
     const FileDescriptor file(
         ::openat(driverFolder, name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    struct flock lock = wholeFile(F_RDLCK); // which a lock for writing stands against, and no other
+    struct flock lock = wholeFile(F_RDLCK); // only a write lock conflicts with it
     return file && ::fcntl(file.get(), F_OFD_GETLK, &lock) == 0 && lock.l_type == F_UNLCK;
 }
 

@@ -1,19 +1,19 @@
-// Who writes the file of a channel, and whether that process is still there.
+// The owner of a channel's file: which publisher writes it, and whether that process still lives.
 //
 //     <root>/<driver>/.kesto-0123456789abcdef.owner                        locked as long as the publisher lives
 //     <root>/<driver>/<group>/<subgroup>/<channel>                         begins with "owner 0123456789abcdef"
-//     <root>/<driver>/<group>/<subgroup>/.kesto-0123456789abcdef.tmp       a file in the making
+//     <root>/<driver>/<group>/<subgroup>/.kesto-0123456789abcdef.tmp       an unfinished file
 //
-// A publisher calls itself by a random number, in the first line of every file that it writes, and holds a lock on the
-// owner file of that name. The kernel takes the lock away with the process, however it ends. So nobody has to know a
-// process by its ID, which is used again and is another one in each namespace. What names an owner whose file is not
-// there, or is not locked, was left by a process that is gone.
+// A publisher writes a random number, its owner, to the first line of every file, and holds a lock on the owner file of
+// that name. The kernel releases the lock when the process ends, for any reason. So process IDs, which are used again
+// and differ between namespaces, are not needed. If a file's owner file is missing or not locked, the publisher has
+// ended.
 //
-// The lock is one for writing, on the open file (F_OFD_SETLK): only those who may write the file can hold it, so that
-// nobody else can pretend that an owner lives; and whoever asks for it does not disturb it. A child that was forked off
-// holds it with its parent, until it ends or executes another program.
+// It is a write lock on the open file (F_OFD_SETLK): only users who may write the file can hold it, so no other user
+// can pretend that an owner lives; and testing the lock does not disturb it. A forked child holds it together with its
+// parent, until the child ends or executes another program.
 //
-// A file that names no owner is that of a writer who knows nothing of this. It counts as long as it is there.
+// A file without an owner comes from a simpler writer. It counts as long as it exists.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -27,20 +27,20 @@ namespace platform {
 
 [[nodiscard]] std::string randomChannelOwner();
 
-// The line that files begin with, and the names of hidden files.
+// The first line of a file, and the names of hidden files.
 [[nodiscard]] std::string channelOwnerLine(std::string_view owner);
 [[nodiscard]] std::string channelOwnerFileName(std::string_view owner);
 [[nodiscard]] std::string channelTemporaryFileName(std::string_view owner);
 
-// Takes the line of the owner off the text of a file; what is no such line stays.
+// Removes the owner's line from the text of a file and returns the owner; other first lines stay.
 [[nodiscard]] std::string_view takeChannelOwner(std::string_view& text);
-// Whom an owner file, or a file in the making, belongs to by its name.
+// The owner in the name of an owner file or an unfinished file.
 [[nodiscard]] std::string_view ownerOfChannelOwnerFile(std::string_view name);
 [[nodiscard]] std::string_view ownerOfChannelTemporaryFile(std::string_view name);
 
-// Makes the owner file and locks it, readable for everybody. Nothing where that cannot be, with `errno`.
+// Makes the owner file, readable for all users, and locks it. On failure it returns no descriptor and sets `errno`.
 [[nodiscard]] FileDescriptor makeChannelOwnerFile(int driverFolder, std::string_view owner);
-// False also where it cannot be told.
+// False also if this cannot be checked.
 [[nodiscard]] bool isChannelOwnerGone(int driverFolder, std::string_view owner);
 
 } // namespace platform

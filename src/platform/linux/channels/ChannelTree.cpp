@@ -1,5 +1,4 @@
-// One walk for one question, with one budget of names, channels and bytes for all of it, and in the order of the
-// names.
+// One walk for each query, in the order of the names, with one budget of names, channels and bytes.
 #include "platform/linux/channels/ChannelTree.h"
 
 #include "foundation/text/Format.h"
@@ -28,7 +27,7 @@ struct CloseFolder {
 };
 using Folder = std::unique_ptr<DIR, CloseFolder>;
 
-// Or the `errno` of why it cannot be opened. Below the root no link is followed.
+// Opens a folder; on failure returns `errno`. Below the root it does not follow links.
 std::expected<Folder, int> openFolder(int parent, const char* name, int linkFlag)
 {
     const int descriptor = ::openat(parent, name, O_RDONLY | O_DIRECTORY | O_CLOEXEC | linkFlag);
@@ -79,7 +78,7 @@ public:
 private:
     enum Level : std::size_t { driverLevel, groupLevel, subgroupLevel, channelLevel, levels };
 
-    // Sorted, so that what is read does not depend on the order in which it was written.
+    // Sorted, so that the result does not depend on the order in which files were made.
     std::vector<Entry> entriesOf(DIR* folder)
     {
         std::vector<Entry> entries;
@@ -120,7 +119,7 @@ private:
             ++(left_.channels == 0 ? reading_.leftOut.beyondChannels : reading_.leftOut.beyondBytes);
             return;
         }
-        if (type != DT_REG && type != DT_UNKNOWN) // to open a device may already do something
+        if (type != DT_REG && type != DT_UNKNOWN) // merely opening a device may have an effect
             return fail("it is not a regular file");
         const auto text = readFile(folder, type);
         if (!text)
@@ -139,7 +138,8 @@ private:
         --left_.channels;
     }
 
-    // Valid until the next one; nothing when it cannot be read, which is noted unless it is gone.
+    // The content, valid until the next call; nothing if the file cannot be read, which is noted unless the file has
+    // gone.
     std::optional<std::string_view> readFile(int folder, unsigned char type)
     {
         const FileDescriptor file(
@@ -148,7 +148,7 @@ private:
             fail("it is not a regular file");
             return std::nullopt;
         }
-        // All that there is, at once: a file in place is replaced and never changed.
+        // One call reads the whole file, because publishers replace files and never change them.
         const ssize_t count = file ? ::read(file.get(), buffer_.data(), buffer_.size()) : -1;
         if (count < 0) {
             if (errno != ENOENT)
@@ -184,10 +184,10 @@ private:
         reading_.problems.push_back({std::move(path), reason});
     }
 
-    // The driver that is being read. Most of its channels have one owner.
+    // The driver that is being read. Usually all its channels have one owner.
     struct Driver {
         int folder = -1;
-        std::string owner = {}; // that was looked up last
+        std::string owner = {}; // the last one that was looked up
         bool isOwnerGone = false;
     };
 

@@ -1,4 +1,4 @@
-// Two sources, asked one after the other with the same question.
+// Reads two sources, one after the other, with the same selection.
 #include "platform/linux/channels/LinuxReportingChannels.h"
 
 #include "platform/linux/channels/ChannelDifference.h"
@@ -9,7 +9,7 @@
 
 namespace platform {
 
-// What was asked for, how many channels there were then, and what was wrong when it was last asked.
+// The selected channels, their number at that time, and the problems of the last reading.
 struct LinuxReportingChannels::Selection final : ChannelSet {
     ChannelSelection selection;
     std::size_t count = 0;
@@ -47,7 +47,7 @@ std::expected<ReportingSample, ReportingChannelError> LinuxReportingChannels::cr
                                                                                             const ChannelSet& channels)
 {
     const auto& subscribed = dynamic_cast<const Selection&>(channels);
-    complaints_.forgetDroppedQuestions(); // not before: one after the other they are asked when the service starts
+    complaints_.forgetDroppedQuestions(); // not earlier: at its start the service makes one query after the other
     auto reading = tree_.read(subscribed.selection);
     auto ofSoundCards = soundCards_.read(subscribed.selection);
     if (!reading && ofSoundCards.empty())

@@ -1,11 +1,11 @@
-// The room of channels: the figures that drivers publish. It reads the channel tree and /proc/asound, and writes
-// nothing.
+// The room of channels: the figures that drivers publish. It reads the channel tree and /proc/asound, and does not
+// write.
 //
-// The reporting channels of this system: those that programs publish in the channel tree, and what the kernel tells
-// about its sound cards.
+// The reporting channels of this system: those that programs publish in the channel tree, and those of the kernel's
+// sound cards.
 //
-// A subscription is to the question and not to the answer: every sample holds what is there when it is taken, so that
-// channels may come and go.
+// A subscription is to a selection and not to a list of channels: every sample holds the channels that exist at that
+// moment, so channels may come and go.
 #pragma once
 
 #include "platform/linux/channels/ChannelComplaints.h"
@@ -26,12 +26,13 @@ public:
     {
     }
 
-    // When the tree cannot be read, the channels of the sound cards come back beside the error.
+    // If the tree cannot be read, it returns the channels of the sound cards beside the error.
     FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
                                       std::optional<std::string_view> subgroup) override;
     [[nodiscard]] std::size_t channelCount(const ChannelSet& channels) const override;
     Subscribed createSubscription(const ChannelSet& channels) override;
-    // When the tree cannot be read, the sample holds those of the sound cards; the error, where they have none.
+    // If the tree cannot be read, the sample holds the channels of the sound cards; without such channels it returns
+    // the error.
     std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
                                                                         const ChannelSet& channels) override;
     std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,

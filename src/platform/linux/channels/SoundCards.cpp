@@ -1,5 +1,5 @@
-// The kernel's text is read for what it says and not by its columns, which differ between kernels; what is not there
-// or not understood is simply no channel.
+// The parser finds values by their names and not by columns, which differ between kernels; missing or unknown text
+// gives no channel.
 #include "platform/linux/channels/SoundCards.h"
 
 #include "foundation/values/String.h"
@@ -19,8 +19,7 @@ bool isNumber(std::string_view text)
     return !text.empty() && text.find_first_not_of("0123456789") == std::string_view::npos;
 }
 
-// The names in a folder that are the prefix and a number, and perhaps one of these letters, in the order of the
-// numbers.
+// The names in a folder of the form prefix, number and perhaps one of these letters, in the order of the numbers.
 std::vector<std::string> numberedNames(const fs::path& folder, std::string_view prefix, std::string_view letters)
 {
     std::vector<std::string> names;
@@ -52,7 +51,7 @@ std::string_view trimmed(std::string_view text)
     return text.substr(first, text.find_last_not_of(" \t") - first + 1);
 }
 
-// What follows "name   :" on its line; empty when there is no such line.
+// The text behind "name :" on its line; empty if the line is missing.
 std::string_view valueOf(std::string_view name, std::string_view text)
 {
     while (!text.empty()) {
@@ -66,7 +65,7 @@ std::string_view valueOf(std::string_view name, std::string_view text)
     return {};
 }
 
-// The number that the text begins with; 0 when there is none, or none that counts something.
+// The number at the start of the text; 0 if it is missing or negative.
 std::int64_t leadingNumber(std::string_view text)
 {
     std::int64_t number = 0;
@@ -84,7 +83,7 @@ std::int64_t milliseconds(std::string_view time)
     return std::min(leadingNumber(time), most) * 1000 + (fraction.size() == digits ? leadingNumber(fraction) : 0);
 }
 
-// Where a stream is, and what the kernel tells of it.
+// A stream's place, and the kernel's files about it.
 class Stream {
 public:
     Stream(ReportingChannel place, std::string name, const fs::path& folder)
@@ -112,7 +111,7 @@ public:
     }
 
 private:
-    // Empty for what is not there, and for what no kernel writes.
+    // Empty for a missing file, and for content that no kernel writes.
     static std::string read(const fs::path& file)
     {
         auto text = readSmallFile(file, SoundCards::largestFile);
@@ -168,7 +167,7 @@ private:
     std::string parameters_;
 };
 
-// "PCH", or the folder's name for a card that tells none.
+// "PCH", or the folder's name for a card without an ID.
 std::string cardName(const fs::path& folder)
 {
     const auto text = readSmallFile(folder / "id", SoundCards::largestFile);

@@ -1,4 +1,4 @@
-// What the kernel's own sound drivers tell about every stream of a sound card, below /proc/asound, as channels.
+// The kernel's statistics of every stream of a sound card, below /proc/asound, as channels.
 //
 //     card0/id                      PCH              the channel's driver
 //     card0/pcm0p/sub0/status       state, pointers  p: played, group "Tx"; c: captured, group "Rx"
@@ -6,14 +6,14 @@
 //
 // A stream has these channels:
 //
-//     sub0 hw_ptr     simple   frames that the hardware has worked through since the stream was prepared
+//     sub0 hw_ptr     simple   frames that the hardware has processed since the stream was prepared
 //     sub0 appl_ptr   simple   frames that the program has written or read since then
-//     sub0 state      state    what the stream does, and for how long
-//     sub0 format     state    what it plays or captures, such as S16_LE/48000/2, and for how long it has been running
+//     sub0 state      state    the state of the stream, and for how long
+//     sub0 format     state    the format, such as S16_LE/48000/2, and for how long the stream has been running
 //
-// A stream that nobody has open has pointers of 0 and neither state nor format. The kernel tells when a stream took up
-// what it does, and nothing of what it did before: so a state stands alone, entered once, and one that begins anew
-// counts from there. Times are milliseconds, and there are none for programs that ask for no time stamps.
+// A stream that is not open has pointers of 0 and neither state nor format. The kernel reports since when a stream is
+// in its state, but no earlier states: so the channel has one state, entered once, and after a change it counts anew.
+// Times are milliseconds, and are missing for programs that do not ask for time stamps.
 #pragma once
 
 #include "platform/linux/channels/ChannelTree.h"
@@ -28,16 +28,16 @@ namespace platform {
 // Any thread.
 class SoundCards {
 public:
-    // Streams beyond are left out. More than any device has.
+    // Further streams are left out. No device has so many.
     static constexpr std::size_t mostStreams = 1024;
-    // Bytes of a file that are looked at.
+    // At most this many bytes of a file are read.
     static constexpr std::size_t largestFile = 4096;
 
-    // The folder is /proc/asound, or one that looks like it.
+    // The folder is /proc/asound, or one of the same form.
     explicit SoundCards(std::filesystem::path root) : root_(std::move(root)) { }
 
-    // The channels of the selection; none where there is no sound card. What cannot be read or understood is missing:
-    // cards come and go.
+    // The selected channels; none without a sound card. Files that cannot be read or parsed are left out, because cards
+    // come and go.
     [[nodiscard]] std::vector<ReportingChannel> read(const ChannelSelection& selection) const;
 
 private:

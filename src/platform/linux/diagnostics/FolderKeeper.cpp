@@ -1,4 +1,5 @@
-// Age is when a file was last written to: names tell the time of a clock that the device's owner may turn back.
+// The age of a file is the time of its last write. Its name holds the wall-clock time, which the device's owner may set
+// back.
 #include "platform/linux/diagnostics/FolderKeeper.h"
 
 #include "platform/linux/files/FilesAt.h"
@@ -16,15 +17,15 @@
 namespace platform {
 namespace {
 
-constexpr std::size_t mostNames = 65536; // that are looked at in one go, whoever filled the folder
+constexpr std::size_t mostNames = 65536; // the most that one look reads, because other users may fill the folder
 
-// What is left when the oldest have gone.
+// The target size after the oldest files are removed.
 template <typename Number> Number threeQuartersOf(Number limit)
 {
     return limit - limit / 4;
 }
 
-// How many of the oldest go. The newest stays, whatever its size.
+// How many of the oldest files to remove. The newest always stays.
 std::size_t howManyGo(std::span<const std::uint64_t> sizes, const KeptFiles& kept)
 {
     if (surplus(sizes, kept.most, kept.mostBytes) == 0)
@@ -55,7 +56,7 @@ void FolderKeeper::added(const std::filesystem::path& folder, const KeptFiles& k
     workQueues_.backgroundQueue().submit([this, folder, kept, open = std::move(open)] { look(folder, kept, open); });
 }
 
-// Files that the disk does not let go count as gone: another attempt with each file that comes would help nobody.
+// Files that cannot be removed count as removed, to avoid another attempt with each new file.
 void FolderKeeper::look(const std::filesystem::path& folder, const KeptFiles& kept, const Open& open)
 {
     const auto opened = open();
@@ -69,7 +70,7 @@ void FolderKeeper::look(const std::filesystem::path& folder, const KeptFiles& ke
         staying = {sizes.size() - going,
                    std::accumulate(sizes.begin() + static_cast<std::ptrdiff_t>(going), sizes.end(), std::uint64_t{0})};
     } else {
-        log_.error("{} cannot be looked through ({}): its oldest files stay", folder.native(), files.error().message());
+        log_.error("{} cannot be searched ({}): its oldest files stay", folder.native(), files.error().message());
     }
     const foundation::Lock lock(lock_);
     Account& account = accounts_[folder];
@@ -83,14 +84,13 @@ void FolderKeeper::removeUnfinished(const std::filesystem::path& folder, int ope
     const auto files = filesIn(opened, isTemporaryName);
     const Removal removal = files ? remove(*files, opened) : Removal{.reason = files.error()};
     if (removal.removed != 0)
-        log_.note("removed {} files from {} that a service which was killed had begun to write", removal.removed,
-                  folder.native());
+        log_.note("removed {} files from {} that a killed service had not finished", removal.removed, folder.native());
     if (removal.reason)
-        log_.error("what a service which was killed had begun to write in {} cannot be removed ({})", folder.native(),
+        log_.error("the unfinished files of a killed service in {} cannot be removed ({})", folder.native(),
                    removal.reason.message());
 }
 
-// The files of that kind, the oldest first; among them what a killed service had begun to write.
+// The files of that kind, the oldest first, with the unfinished files of a killed service.
 std::expected<std::vector<FolderKeeper::File>, std::error_code>
 FolderKeeper::filesIn(int folder, bool (*isOne)(std::string_view name))
 {

@@ -1,12 +1,11 @@
 // Keeps folders that fill up with files of the service's own within limits: beyond them the oldest files go.
 //
-// To look through a folder costs as much as there is in it. So what comes in is only added up, whoever writes it waits
-// for nothing more, and the folder is looked through in the background when the sum passes a limit. It is cleared down
-// to three quarters then, so that the next look comes a thousand files later and not with the next one.
+// The cost of reading a folder grows with its files. So for each new file only a sum is updated, while its writer
+// waits, and the folder is read in the background when the sum passes a limit. Then it is cleared down to three
+// quarters, so that the next look comes a thousand files later and not with the next file.
 //
-// Others may have files there as well, or write into the folder what looks like ours: removed is only what has the
-// shape of our names, is a regular file and belongs to the service's user, and it is removed by its name in the folder
-// that is open.
+// Other users may have files there as well, or make files that look like the service's. So the keeper removes only
+// regular files of the service's user with the right form of name, and removes them by their name in the open folder.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -29,15 +28,15 @@ public:
 
     FolderKeeper(WorkQueues& workQueues, ProviderLog log) : workQueues_(workQueues), log_(log) { }
 
-    // A file of so many bytes has come into the folder, which `open` opens: on the background queue, if at all. A look
-    // that removes files says so in the log, in one line.
+    // A file of so many bytes was added to the folder. If a look is due, `open` is called on the background queue to
+    // open the folder. A look that removes files logs one line.
     void added(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes, Open open);
 
-    // Removes what a process that was killed had begun to write in the folder that is open, and says so in the log. Not
-    // while anybody writes there.
+    // Removes the unfinished files of a killed process from the open folder, and logs this. Only while no file there is
+    // being written.
     void removeUnfinished(const std::filesystem::path& folder, int opened);
 
-    // Since the start, of the oldest.
+    // How many of the oldest files were removed since the start.
     [[nodiscard]] std::uint64_t removedFiles() const noexcept { return removedFiles_; }
 
 private:
@@ -47,9 +46,9 @@ private:
         std::uint64_t bytes = 0;
     };
     struct Account {
-        Contents contents = {}; // as far as is known, or more: what comes during a look may be counted twice
-        bool isKnown = false; // there was a look
-        bool isLookedThrough = false; // right now
+        Contents contents = {}; // an upper estimate: files that come during a look may count twice
+        bool isKnown = false; // after the first look
+        bool isLookedThrough = false; // a look is running
     };
 
     // The background queue.
@@ -57,7 +56,7 @@ private:
     struct Removal {
         std::size_t removed = 0;
         std::size_t staying = 0;
-        std::error_code reason; // of the last one that stays
+        std::error_code reason; // why the last of these files could not be removed
     };
     [[nodiscard]] static std::expected<std::vector<File>, std::error_code>
     filesIn(int folder, bool (*isOne)(std::string_view name));
@@ -69,7 +68,7 @@ private:
     const ProviderLog log_;
     std::atomic<std::uint64_t> removedFiles_ = 0;
     foundation::Mutex lock_;
-    std::map<std::filesystem::path, Account> accounts_ KESTO_GUARDED_BY(lock_); // callers have few folders
+    std::map<std::filesystem::path, Account> accounts_ KESTO_GUARDED_BY(lock_); // never large: callers have few folders
 };
 
 } // namespace platform

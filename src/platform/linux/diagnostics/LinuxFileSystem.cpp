@@ -1,4 +1,4 @@
-// Paths are taken apart and walked one folder at a time, each by its descriptor: what was checked is what is used.
+// A path is walked one folder at a time, each by its descriptor, so that the checked folder is the one that is used.
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 
 #include "foundation/text/Format.h"
@@ -65,7 +65,7 @@ private:
     bool isCommitted_ = false;
 };
 
-// Makes the folder with exactly these permissions, unless something stands there.
+// Makes the folder with exactly these permissions, unless the name is taken.
 std::error_code makeIfMissing(int parent, const char* name, unsigned permissions)
 {
     if (::mkdirat(parent, name, permissions) != 0)
@@ -173,7 +173,7 @@ std::expected<std::string, std::error_code> LinuxFileSystem::readFile(const std:
                                                                       std::size_t limit)
 {
     const std::unexpected notAFile(std::make_error_code(std::errc::invalid_argument));
-    if (path.native().contains('\0')) // the system would take what is before it for the path
+    if (path.native().contains('\0')) // the system would take the part before it for the path
         return notAFile;
     const FileDescriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
     struct stat status = {};

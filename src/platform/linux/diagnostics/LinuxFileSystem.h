@@ -2,17 +2,17 @@
 //
 // Folders and files of the service's own, and files that clients name, on the real file system.
 //
-// A file is written under a name of its own beside its place and then renamed, so that whoever reads it sees the
-// old one or the new one and never half of it.
+// A file is written under a temporary name beside its place and then renamed, so that a reader sees the old or the new
+// file and never an unfinished one.
 //
-// Some folders may be written to by everybody, and what stands there is not to be trusted: a link put in the place of a
-// folder would have the service write, or open to everybody, where its maker may not. So every step below the
-// diagnostic-log root is taken from the folder before it, and none through a link. The root itself may be one: it is
-// the administrator's. If it goes while the service runs, it is made again with the permissions that it had, where the
-// service may: what is reported from then on would be lost otherwise.
+// Every user may write to some folders, so the service does not trust their content: with a link in the place of a
+// folder another user could make the service write, or set permissions, where that user may not. So every step below
+// the diagnostic-log root starts from the open folder before it, and no step follows a link. The root itself may be a
+// link: the administrator made it. If the root is removed while the service runs, it is made again with its earlier
+// permissions, where the service has the right: otherwise later reports would be lost.
 //
-// A client may name a device, and of a device even the opening may do something. So what is named is only pointed at,
-// looked at, and opened as what was seen.
+// A client may name a device file, and merely opening a device may have an effect. So the service first gets a
+// descriptor that does not open the file (O_PATH), checks the kind of the file, and only then opens this same file.
 #pragma once
 
 #include "platform/FileSystem.h"
@@ -27,7 +27,7 @@ class FolderKeeper;
 // Any thread. It outlives the background queue's work.
 class LinuxFileSystem final : public FileSystem {
 public:
-    // Without a keeper, which outlives it, no folder is kept within limits.
+    // The keeper must outlive it. Without a keeper folders have no limits.
     explicit LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderKeeper* keeper = nullptr);
 
     [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return diagnosticLogRoot_; }
@@ -39,19 +39,19 @@ public:
     [[nodiscard]] std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,
                                                                        std::size_t limit) override;
 
-    // For the start, before anything is written: removes what a service that was killed had begun to write in the
-    // folder. A folder that is missing is as good as an empty one.
+    // Removes the unfinished files of a killed service from the folder. Call it at the start, before anything is
+    // written. A missing folder counts as empty.
     void removeUnfinished(const std::filesystem::path& folder);
 
 private:
-    // Makes the root again as it was in the beginning, and the folders above it that went with it.
+    // Makes the root again as it was at the start, and missing folders above it.
     [[nodiscard]] std::error_code makeRootAgain() const;
-    // Steps down from the root, and makes the folders on the way that are missing, if there are permissions for them.
+    // Walks down from the root, and makes missing folders on the way if `permissions` are given.
     [[nodiscard]] std::expected<FileDescriptor, std::error_code>
     openDirectory(const std::filesystem::path& path, std::optional<unsigned> permissionsOfMissing) const;
 
     const std::filesystem::path diagnosticLogRoot_;
-    const std::optional<unsigned> rootPermissions_; // in the beginning; nothing when there was none
+    const std::optional<unsigned> rootPermissions_; // at the start; nothing if the root did not exist
     FolderKeeper* const keeper_;
 };
 

@@ -1,4 +1,4 @@
-// An open file of the process, closed by whoever holds it last.
+// An open file of the process; its last owner closes it.
 #pragma once
 
 #include <unistd.h>

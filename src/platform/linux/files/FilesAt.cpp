@@ -1,4 +1,4 @@
-// Thin over the kernel's *at calls: that none of them ever follows a link is what this file is for.
+// A thin layer over the kernel's *at calls, which ensures that none of them follows a link.
 #include "platform/linux/files/FilesAt.h"
 
 #include "platform/linux/files/SystemError.h"
@@ -19,7 +19,7 @@ namespace platform {
 namespace {
 
 constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
-constexpr unsigned deepestTree = 8; // that is removed; none of ours is deeper
+constexpr unsigned deepestTree = 8; // that `removeTreeAt` removes; the service's own are not deeper
 constexpr std::string_view temporaryBegin = ".kestod-";
 constexpr std::string_view temporaryEnd = ".tmp";
 
@@ -53,7 +53,7 @@ std::expected<FileDescriptor, std::error_code> openDirectoryAt(int directory, co
 
 std::expected<std::vector<std::string>, std::error_code> namesIn(int directory, std::size_t most)
 {
-    // A descriptor of its own, since reading moves its place in the folder.
+    // Reading changes the descriptor's position, so this uses one of its own.
     const int own = ::openat(directory, ".", O_RDONLY | O_DIRECTORY | O_CLOEXEC);
     if (own < 0)
         return std::unexpected(systemError());
@@ -80,7 +80,7 @@ std::expected<std::string, std::error_code> readFileAt(int directory, const std:
         return std::unexpected(systemError());
     if (!S_ISREG(status.st_mode))
         return std::unexpected(make_error_code(std::errc::invalid_argument));
-    constexpr std::size_t piece = 4096; // files of /proc have no size: only the end tells the length
+    constexpr std::size_t piece = 4096; // files of /proc report no size: the length is known only at the end
     std::string bytes;
     std::size_t length = 0;
     while (length < most) {

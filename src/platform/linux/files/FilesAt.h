@@ -1,7 +1,7 @@
-// The room of files: what all other rooms need to touch a file safely. It knows no place and no content.
+// The room of files: functions with which all other rooms use files safely. It depends on no path and no content.
 //
-// Files and folders by their names in a folder that is open: one step at a time, and never through a link. Wherever a
-// link was put, what is read, written or removed is what the folder itself holds.
+// Files and folders by their names in an open folder: one step at a time, and never through a link. So these functions
+// read, write and remove only entries of the folder itself.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -20,26 +20,26 @@ namespace platform {
 
 [[nodiscard]] std::expected<FileDescriptor, std::error_code> openDirectoryAt(int directory, const std::string& name);
 
-// What the folder holds, hidden names too, in the order of the names; of a folder with more only so many.
+// The sorted names in the folder, hidden ones too; at most so many.
 [[nodiscard]] std::expected<std::vector<std::string>, std::error_code> namesIn(int directory, std::size_t most);
 
-// The first bytes of a regular file, so many at most; `errc::invalid_argument` when it is something else. Does not
+// The first bytes of a regular file, at most so many; `errc::invalid_argument` if it is not a regular file. Does not
 // wait.
 [[nodiscard]] std::expected<std::string, std::error_code> readFileAt(int directory, const std::string& name,
                                                                      std::size_t most);
 
-// For a file in the making: hidden, and not to be foreseen by who would like to be there first.
+// A name for an unfinished file: hidden, and random, so that another process cannot take it first.
 [[nodiscard]] std::string temporaryName();
-// Whether it is the name of one, which is there for good if its maker was killed.
+// Whether it is such a name. A killed process leaves its unfinished files.
 [[nodiscard]] bool isTemporaryName(std::string_view name);
 
-// Writes a file that is not there yet, down to the disk.
+// Writes a new file, down to the disk.
 [[nodiscard]] std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes);
 
-// How many bytes the files of a folder have, without those of folders in it.
+// The total size of the files in a folder, without subfolders.
 [[nodiscard]] std::uint64_t bytesOfFilesIn(int directory);
 
-// Removes a file, a link, or a folder with everything in it; false when there is none, or something of it stays.
+// Removes a file, a link, or a folder with everything in it; false if it does not exist or a part of it stays.
 bool removeTreeAt(int directory, const std::string& name);
 
 } // namespace platform

@@ -1,4 +1,4 @@
-// What is kept for somebody who may look into it one day must end somewhere: beyond a number or a size the oldest goes.
+// Bounds for kept files: beyond a number or a size the oldest are removed.
 #pragma once
 
 #include <cstddef>
@@ -8,7 +8,8 @@
 
 namespace platform {
 
-// Of things in the order of their age, the oldest first: how many must go so that the others are within the limits.
+// How many of the items must be removed so that the others are within the limits. The items are sorted, the oldest
+// first.
 [[nodiscard]] inline std::size_t surplus(std::span<const std::uint64_t> bytesOfEach, std::size_t most,
                                          std::uint64_t mostBytes)
 {

@@ -1,4 +1,4 @@
-// The size that the kernel tells is taken for a hint: files of /proc tell none, and others may grow meanwhile.
+// The size that the kernel reports is only a hint: files of /proc report none, and others may grow meanwhile.
 #include "platform/linux/files/SmallFile.h"
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -20,7 +20,7 @@ std::expected<std::string, std::error_code> readSmallFile(const std::filesystem:
     if (!S_ISREG(status.st_mode))
         return std::unexpected(make_error_code(std::errc::invalid_argument));
 
-    // Files of /proc have no size, and any file may grow while it is read: only the end tells the length.
+    // Files of /proc report no size, and any file may grow while it is read: the length is known only at the end.
     constexpr std::size_t smallestRead = 64;
     std::string bytes;
     for (std::size_t length = 0;;) {

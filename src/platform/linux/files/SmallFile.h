@@ -1,5 +1,4 @@
-// Reading a whole small file, whatever stands at its path: opening never blocks, only regular files are read,
-// and none beyond a limit.
+// Reading a whole small file at any path: opening never blocks, and only regular files within a limit are read.
 #pragma once
 
 #include <cstddef>
@@ -10,8 +9,8 @@
 
 namespace platform {
 
-// The bytes of the file. `errc::no_such_file_or_directory` when there is none, `errc::file_too_large` when it
-// is longer than the limit, `errc::invalid_argument` when it is no regular file. Any thread.
+// The bytes of the file. `errc::no_such_file_or_directory` if it does not exist, `errc::file_too_large` if it is longer
+// than the limit, `errc::invalid_argument` if it is not a regular file. Any thread.
 [[nodiscard]] std::expected<std::string, std::error_code> readSmallFile(const std::filesystem::path& path,
                                                                         std::size_t limit);
 

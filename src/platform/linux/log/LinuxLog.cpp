@@ -1,5 +1,4 @@
-// A line is made once, escaped and cut, whichever way it leaves, so that the journal, standard error and a bug
-// capture all say the same.
+// A line is made once, escaped and cut, so that the journal, standard error and a bug capture have the same text.
 #include "platform/linux/log/LinuxLog.h"
 
 #include "foundation/values/String.h"

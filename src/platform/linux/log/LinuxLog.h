@@ -1,12 +1,12 @@
-// The room of the log: lines to journald or to a descriptor, the levels that are wanted, and the last lines for a
-// snapshot. It touches journald's socket and one descriptor.
+// The room of the log: lines to journald or to a descriptor, the enabled levels, and the last lines for a snapshot. It
+// uses journald's socket and one descriptor.
 //
 // The log: journald where the service runs under it, standard error elsewhere.
 //
-// To the journal goes one datagram a line in its native protocol, with the category and the place of the
-// statement as fields that can be searched; to a descriptor one write a line. What clients say ends up in
-// messages, so no message can look like two: line ends and other control characters are written as escapes,
-// which also keeps them from ending a field of the protocol or steering somebody's terminal.
+// The journal gets one datagram for each line in its native protocol, with the category and the place of the statement
+// as fields that can be searched; a descriptor gets one write for each line. Messages hold text from clients, so line
+// ends and other control characters are written as escapes: a message cannot look like two lines, end a field of the
+// protocol, or control a reader's terminal.
 #pragma once
 
 #include "platform/Log.h"
@@ -28,10 +28,10 @@ public:
         int descriptor = 2; // not owned
     };
 
-    // In bytes; the rest of a longer message is cut off, and the line says how much.
+    // In bytes; a longer message is cut, and the line reports how many bytes were cut.
     static constexpr std::size_t longestMessage = 32768;
 
-    // The journal when standard error is connected to it, as JOURNAL_STREAM tells, else standard error.
+    // The journal if JOURNAL_STREAM shows that standard error is connected to it, else standard error.
     [[nodiscard]] static Destination destinationOfThisProcess();
 
     LinuxLog(LogThresholds thresholds, const Destination& destination);
@@ -41,12 +41,12 @@ public:
         return thresholds_.threshold(category.tag());
     }
 
-    // Waits for a journal that is behind, but not long and not again until it took a line: what it does not
-    // take is lost, and the next line that it takes is followed by one that tells how many were. A journal
-    // that is not there is replaced by the descriptor.
+    // Waits a short time for a slow journal, and does not wait again before the journal has taken a line. Lines that it
+    // does not take are lost; after the next line that it takes, a line reports their number. If the journal does not
+    // exist, lines go to the descriptor.
     void write(const LogRecord& record) override;
 
-    // What was written last, wherever it went.
+    // The last lines, for both destinations.
     [[nodiscard]] const RecentLogLines& recentLines() const noexcept { return recentLines_; }
 
 private:
@@ -59,7 +59,7 @@ private:
 
     const LogThresholds thresholds_;
     const int descriptor_;
-    FileDescriptor journal_; // none: there is no journal
+    FileDescriptor journal_; // empty without a journal
     sockaddr_un journalAddress_{};
     std::atomic<bool> journalIsBehind_ = false;
     std::atomic<std::uint64_t> lostLines_ = 0;

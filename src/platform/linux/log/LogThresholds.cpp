@@ -1,4 +1,4 @@
-// Read item by item; the first that is wrong is named as it was written.
+// The list is read item by item; the error quotes the first wrong item.
 #include "platform/linux/log/LogThresholds.h"
 
 #include <algorithm>

@@ -1,7 +1,6 @@
-// Which log statements are let through: one level for all, and others for single tags.
+// Which log statements are enabled: one level for all tags, and other levels for single tags.
 //
-// Written as a list such as "info" or "default,kerr=debug,kers=error"; where two items speak of the same tag
-// the later one counts.
+// Written as a list such as "info" or "default,kerr=debug,kers=error"; of two items for one tag the later counts.
 #pragma once
 
 #include "platform/Log.h"
@@ -16,7 +15,7 @@ namespace platform {
 // Plain data. Any thread.
 class LogThresholds {
 public:
-    // Reads such a list; the empty one is the default. The error says what was wrong and what may stand there.
+    // Reads such a list; an empty list gives the default. The error quotes the wrong item and names the allowed forms.
     [[nodiscard]] static std::expected<LogThresholds, std::string> parse(std::string_view text);
 
     [[nodiscard]] LogLevel threshold(std::string_view tag) const;

@@ -1,7 +1,7 @@
 // How the providers themselves write to the log.
 //
-// They are made, and some of their threads run, before the platform is installed and after it is taken away,
-// so they hold the log that they were given and never ask for the current one.
+// Providers, and some of their threads, exist before the platform is installed and after it is removed, so they hold a
+// log of their own and never use the current platform's.
 #pragma once
 
 #include "platform/Log.h"
@@ -14,13 +14,13 @@
 
 namespace platform {
 
-// The category of what the providers have to say.
+// The category of the providers' lines.
 inline constinit LogCategory providerCategory{"com.quarn.kesto", "kerl"};
 
-// A copy is as good as the original. Any thread.
+// Copies share the log. Any thread.
 class ProviderLog {
 public:
-    // A format that is checked when it is compiled, and the line that it stands in.
+    // A format that the compiler checks, and its place in the source.
     template <typename... Arguments> struct Format {
         template <std::convertible_to<std::string_view> Text>
         consteval Format(const Text& given, std::source_location where = std::source_location::current())
@@ -35,14 +35,14 @@ public:
     // The log outlives every provider.
     explicit ProviderLog(Log& log) noexcept : log_(&log) { }
 
-    // Something does not work, and its owner can do something about it: the line says what.
+    // Logs a failure; the line says what its owner can do.
     template <typename... Arguments>
     void error(Format<std::type_identity_t<Arguments>...> format, const Arguments&... arguments) const
     {
         write(LogLevel::Error, format.location, format.text, fmt::make_format_args(arguments...));
     }
 
-    // Something worth knowing happened.
+    // Logs an event that an engineer should see.
     template <typename... Arguments>
     void note(Format<std::type_identity_t<Arguments>...> format, const Arguments&... arguments) const
     {

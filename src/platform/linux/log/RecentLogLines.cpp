@@ -1,4 +1,4 @@
-// Times become text only for whoever captures a bug: lines come by all the time, bugs hardly ever.
+// Times become text only when a bug is captured: lines are frequent, bugs are rare.
 #include "platform/linux/log/RecentLogLines.h"
 
 #include "foundation/text/LocalTime.h"

@@ -1,5 +1,5 @@
-// The last lines of the log, kept in memory: when a bug is captured, what the service said just before is half of the
-// evidence, and the journal may belong to somebody else.
+// The last lines of the log, kept in memory: they are half of the evidence of a bug, and the service may not be allowed
+// to read the journal.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -15,12 +15,12 @@ namespace platform {
 // Any thread.
 class RecentLogLines {
 public:
-    // The oldest lines make room for the newest.
+    // Beyond these limits the oldest lines are dropped.
     static constexpr std::size_t mostLines = 500;
     static constexpr std::size_t mostBytes = std::size_t{64} * 1024; // of their text
-    static constexpr std::size_t longestLine = 4096; // in bytes; of a longer one the beginning is kept
+    static constexpr std::size_t longestLine = 4096; // in bytes; the beginning of a longer line is kept
 
-    // A line as it was written, with its prefix, and when it was: seconds since 1970.
+    // Adds a line as it was written, with its prefix, and its time in seconds since 1970.
     void add(double time, LogLevel level, std::string_view tag, std::string_view line);
 
     // A line each, the oldest first: local time, level, tag, and the line.
@@ -30,7 +30,7 @@ private:
     struct Line {
         double time;
         LogLevel level;
-        std::string_view tag; // of a category, which lives as long as the process
+        std::string_view tag; // of a category, so it lives as long as the process
         std::string text;
     };
 

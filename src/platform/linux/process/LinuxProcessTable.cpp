@@ -1,5 +1,5 @@
-// Names from /proc/<pid>/comm. A process's place in the memory of names is its number modulo the size: no list to
-// keep in order, and nothing that clients can make grow.
+// Names from /proc/<pid>/comm. A process's place in the cache is its number modulo the size: the cache needs no order,
+// and clients cannot make it grow.
 #include "platform/linux/process/LinuxProcessTable.h"
 
 #include "foundation/values/String.h"

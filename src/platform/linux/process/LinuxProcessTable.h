@@ -2,8 +2,8 @@
 //
 // The process table as /proc shows it.
 //
-// The sender's name is asked for with every message, so what was read is believed for a second. That a process
-// changed its name, or that its number went to another, is noticed that much later, unless it is forgotten before.
+// Every message asks for the sender's name, so a name is cached for a second. If a process changes its name, or its
+// number passes to another process, the cache notices this up to a second later, unless `forget` was called.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -21,22 +21,22 @@ public:
     using Now = std::chrono::nanoseconds (*)(); // a clock that never goes back
 
     static constexpr std::chrono::seconds longestBelieved{1};
-    static constexpr std::size_t mostKept = 64; // processes; each has one place, which it may lose to another
+    static constexpr std::size_t mostKept = 64; // processes; two processes may compete for one place
 
     explicit LinuxProcessTable(Now now = &coarseMonotonicTime);
 
     [[nodiscard]] std::int32_t ownProcessIdentifier() const override { return ownIdentifier_; }
     [[nodiscard]] std::string ownProcessName() const override { return ownName_; }
-    // The name with a "?" for each byte that is not UTF-8.
+    // In the name, each byte that is not UTF-8 is a "?".
     [[nodiscard]] std::optional<ProcessTableEntry> entry(std::int32_t processIdentifier) const override;
     void forget(std::int32_t processIdentifier) override;
 
-    // To the tick, which is much finer than a second and much faster to read than the exact time.
+    // Exact to a tick, which is much finer than a second and much faster to read than the exact time.
     [[nodiscard]] static std::chrono::nanoseconds coarseMonotonicTime();
 
 private:
     struct Kept {
-        ProcessTableEntry entry; // of process 0, which there is not, while the place is free
+        ProcessTableEntry entry; // of process 0, which does not exist, while the place is free
         std::chrono::nanoseconds readAt{};
     };
 

@@ -1,5 +1,4 @@
-// A notification that does not arrive harms nobody but the service manager, which has time-outs of its own: no failure
-// is looked for.
+// Failures are ignored: a lost notification affects only the service manager, which has time-outs of its own.
 #include "platform/linux/process/ServiceManager.h"
 
 #include <systemd/sd-daemon.h>

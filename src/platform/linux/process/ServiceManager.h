@@ -1,12 +1,12 @@
-// What the service tells the service manager that started it.
+// Notifications to the service manager that started the service.
 #pragma once
 
 #include <string>
 
 namespace platform {
 
-// That the service now takes connections, and one line for people who ask how it is. Nothing happens where no
-// service manager wants to know. Any thread.
+// Reports that the service now takes connections, with one line about its status for people. Does nothing without a
+// service manager. Any thread.
 void notifyReady(const std::string& status);
 
 } // namespace platform

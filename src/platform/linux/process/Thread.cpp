@@ -23,8 +23,7 @@ constexpr int niceness(QualityOfService quality) noexcept
 
 } // namespace
 
-// To Linux a thread is a process of its own when it comes to priorities; that of the first thread counts as the
-// process's, until it is given another here.
+// Linux sets priorities by thread. The first thread's priority counts as the process's, until this function changes it.
 void setQualityOfThisThread(QualityOfService quality)
 {
     static const int ofTheProcess = getpriority(PRIO_PROCESS, static_cast<id_t>(getpid()));

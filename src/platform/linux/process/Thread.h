@@ -1,4 +1,4 @@
-// Threads that a debugger and a scheduler can tell apart: each has a name and a priority.
+// Threads with a name, for debuggers, and a priority, for the scheduler.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -9,11 +9,11 @@
 
 namespace platform {
 
-// The part of a dotted name that the kernel has room for (15 bytes): "com.example.server" is "server".
+// The last part of a dotted name, cut to the kernel's 15 bytes: "com.example.server" gives "server".
 [[nodiscard]] std::string threadName(std::string_view name);
 
-// Gives the calling thread the priority that goes with the quality of service, as far as the process may choose it: a
-// raised one that is refused is no failure.
+// Gives the calling thread the priority of the quality of service. If the system refuses a higher priority, this is not
+// a failure.
 void setQualityOfThisThread(QualityOfService quality);
 
 // Starts a thread of that name and quality.

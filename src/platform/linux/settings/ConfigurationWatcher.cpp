@@ -1,5 +1,5 @@
-// inotify watches what is there. So what is not there yet is awaited by its name in the nearest directory above, and
-// each time that something of the kind comes or goes, all is looked at anew.
+// inotify watches only existing directories. So the watcher awaits a missing directory by its name in the nearest
+// directory above it, and checks all directories anew each time that such a name comes or goes.
 #include "platform/linux/settings/ConfigurationWatcher.h"
 
 #include "platform/linux/process/Thread.h"
@@ -18,7 +18,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// A file counts as changed when who wrote it closes it, not with every piece that is written.
+// A file counts as changed when its writer closes it, not at every write.
 constexpr std::uint32_t changesOfFiles =
     IN_CLOSE_WRITE | IN_CREATE | IN_MOVED_TO | IN_MOVED_FROM | IN_DELETE | IN_ATTRIB;
 // A touch changes a file's times and may not even open it.
@@ -61,7 +61,7 @@ std::unique_ptr<ConfigurationWatcher::Watch> ConfigurationWatcher::watch(const f
     return watch;
 }
 
-// With the first watch. False when the kernel refuses.
+// Called with the first watch. False if the kernel refuses.
 bool ConfigurationWatcher::start()
 {
     if (!std::exchange(isStarted_, true)) {
@@ -75,9 +75,9 @@ bool ConfigurationWatcher::start()
     return thread_.joinable();
 }
 
-// Anew for everything that is watched: directories are few, and what became of them is not worth telling apart. One
-// that is still there is watched without a gap, for the kernel knows it again and gives it the descriptor that it had.
-// Returns the directories whose files were not watched before.
+// Sets up all watches anew: there are few directories, so single changes need no treatment of their own. An unchanged
+// directory is watched without a gap, because the kernel recognises it and returns the same descriptor. Returns the
+// directories whose files were not watched before.
 std::set<fs::path> ConfigurationWatcher::arm()
 {
     const auto before = std::exchange(places_, {});
@@ -98,7 +98,7 @@ std::set<fs::path> ConfigurationWatcher::arm()
     return added;
 }
 
-// Watches the directory or, while it is not there, the nearest one above it for the name that is missing.
+// Watches the directory or, while it is missing, the nearest directory above it for the missing name.
 void ConfigurationWatcher::armFor(const fs::path& wanted)
 {
     fs::path directory = wanted;
@@ -111,11 +111,11 @@ void ConfigurationWatcher::armFor(const fs::path& wanted)
         place->awaited.insert(missing);
         if (!isThere(directory / missing))
             return;
-        directory = wanted; // it came to be just before its name was awaited
+        directory = wanted; // it was made just before its name was awaited
     }
 }
 
-// The directory, or the first of those above it that is there; null when the kernel refuses.
+// Watches the directory or the nearest existing one above it; null if the kernel refuses.
 ConfigurationWatcher::Place* ConfigurationWatcher::add(fs::path& directory, std::string& missing)
 {
     for (;;) {
@@ -162,7 +162,7 @@ void ConfigurationWatcher::handleEvents()
         if ((event.mask & IN_Q_OVERFLOW) != 0)
             eventsWereLost = true;
         else if (place == places_.end())
-            continue; // of a watch that was taken away meanwhile
+            continue; // of a watch that was removed meanwhile
         else if ((event.mask & (endsOfDirectories | IN_IGNORED | IN_UNMOUNT)) != 0
                  || place->second.awaited.contains(fileName))
             structureChanged = true;

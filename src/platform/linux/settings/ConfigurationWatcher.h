@@ -1,11 +1,11 @@
 // The room of settings: preferences, features, device properties and notifications. It reads the configuration
 // directory, watches it with inotify, and never writes there.
 //
-// Notices when files of the configuration directory change, whichever way that happens: written in place,
-// replaced, removed, or come to be with a directory that was not there before.
+// Notices every change of files in the configuration directory: files that are written in place, replaced, removed, or
+// made together with their directory.
 //
-// One thread for all of the configuration. It sleeps in the kernel until something changes, and is not even
-// started before somebody wants to know.
+// One thread watches the whole configuration. It sleeps in the kernel until something changes, and starts with the
+// first watch.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -24,20 +24,20 @@
 
 namespace platform {
 
-// Any thread, but its own.
+// Any thread except its own.
 class ConfigurationWatcher {
 public:
-    // Told on the watcher's thread which file of the watched directory may have changed; without a name, that any of
-    // them may have: the directory came to be with whatever is in it, or changes were more than the kernel remembers.
+    // Called on the watcher's thread with the name of a file in the watched directory that may have changed. Without a
+    // name any of the files may have changed: the directory was made with files in it, or the kernel lost events.
     using Handler = std::function<void(std::string_view fileName)>;
 
-    // Which changes of files somebody wants to know.
+    // Which changes of files a watch reports.
     enum class Changes : std::uint8_t {
-        All, // without a name also when it is merely not known that nothing changed
-        Writes // that a file was written to its end, put in place or touched; also when it holds what it held before
+        All, // calls without a name also if changes merely cannot be excluded
+        Writes // a file was written and closed, put in place or touched, even with the same content
     };
 
-    // What somebody watches; it ends with this object, which waits for a handler that is running.
+    // A watch ends with this object, whose destructor waits for a running handler.
     class Watch {
     public:
         ~Watch();
@@ -59,27 +59,27 @@ public:
         const Handler handler_;
     };
 
-    // The configuration directory, which need not be there yet.
+    // The configuration directory may be missing.
     ConfigurationWatcher(std::filesystem::path root, ProviderLog log);
-    // All watches have ended before.
+    // All watches must have ended.
     ~ConfigurationWatcher();
     ConfigurationWatcher(const ConfigurationWatcher&) = delete;
     ConfigurationWatcher& operator=(const ConfigurationWatcher&) = delete;
 
     [[nodiscard]] const std::filesystem::path& root() const noexcept { return root_; }
 
-    // Watches the files of the root, of a directory in it, or of any other given by its absolute path. From the moment
-    // this returns, no change is missed: watch first, then read. Where the kernel refuses to watch, one line of the log
-    // says so and changes take effect at the next start.
+    // Watches the files of the root, of a directory in it, or of any other given by its absolute path. After it
+    // returns, no change is missed: watch first, then read. If the kernel refuses, one line is logged, and changes take
+    // effect at the next start.
     [[nodiscard]] std::unique_ptr<Watch> watch(const std::filesystem::path& subdirectory, Handler handler,
                                                Changes changes = Changes::All);
 
 private:
-    // What an inotify watch is there for.
+    // The purpose of an inotify watch.
     struct Place {
         std::filesystem::path directory;
-        bool isWanted = false; // somebody watches its files
-        // The names in it that decide whether a wanted directory further down is there.
+        bool isWanted = false; // a watch needs its files
+        // The names in it on the way to missing directories that watches need.
         std::set<std::string, std::less<>> awaited;
     };
 

@@ -1,4 +1,4 @@
-// A property that is no truth value is read as one, as a preference would be.
+// A property of another type is converted to a truth value, as a preference would be.
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 
 namespace platform {

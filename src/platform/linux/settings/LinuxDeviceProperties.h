@@ -1,4 +1,4 @@
-// Device properties from device.toml in the configuration directory: a truth value a property.
+// Device properties from device.toml in the configuration directory: one truth value for each property.
 #pragma once
 
 #include "platform/DeviceProperties.h"

@@ -1,4 +1,4 @@
-// Whatever is not plainly switched on is off: a flag, a table or a file that is missing or of another kind.
+// A flag is off if it, its table or the file is missing or has another type.
 #include "platform/linux/settings/LinuxFeatureFlags.h"
 
 namespace platform {

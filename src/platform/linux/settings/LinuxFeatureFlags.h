@@ -1,5 +1,5 @@
-// Feature flags from feature-flags.toml in the configuration directory: a table a domain, in it a truth value a
-// flag.
+// Feature flags from feature-flags.toml in the configuration directory: one table for each domain, with one truth value
+// for each flag.
 #pragma once
 
 #include "platform/FeatureFlags.h"

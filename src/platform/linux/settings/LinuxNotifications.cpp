@@ -1,5 +1,5 @@
-// A post is whatever ends with a file in place: the watcher's word for it is taken, and the state is read only when
-// it is asked for, as it is then.
+// Every change that leaves a file in place is a post, as the watcher reports it. The state is read only when a caller
+// asks for it.
 #include "platform/linux/settings/LinuxNotifications.h"
 
 #include "platform/linux/files/SmallFile.h"
@@ -13,7 +13,7 @@
 namespace platform {
 namespace {
 
-constexpr std::size_t longestState = 64; // in bytes, with whatever blanks and line ends stand around the number
+constexpr std::size_t longestState = 64; // in bytes, with blanks and line ends around the number
 
 bool isFileName(std::string_view name) noexcept
 {
@@ -23,10 +23,11 @@ bool isFileName(std::string_view name) noexcept
         && name.find_first_of(separators) == std::string_view::npos;
 }
 
-// 0, or why there is no such directory.
+// 0, or the error number.
 int makeDirectory(const std::filesystem::path& path)
 {
-    constexpr mode_t nobodyElseWrites = 0755; // whatever the umask: who writes there decides what sessions are told
+    // Set despite the umask: a process that may write there decides what sessions get.
+    constexpr mode_t nobodyElseWrites = 0755;
     if (::mkdir(path.c_str(), nobodyElseWrites) == 0)
         return 0;
     const int error = errno;
@@ -101,7 +102,7 @@ void LinuxNotifications::post(std::string_view name)
     }
 }
 
-// Without a name, any of the files may have been written.
+// Without a name any of the files may have been written.
 void LinuxNotifications::handleWrite(std::string_view fileName)
 {
     if (!fileName.empty())

@@ -1,8 +1,6 @@
-// System notifications as files: a file in the notifications directory is a name, its text the 64-bit state in
-// decimal, and whoever writes or touches it posts the name.
-//
-// So a shell can post one, any process with rights on the directory can, and a name's state is there for whoever
-// comes later.
+// System notifications as files: a file in the notifications directory is a name, and its text the 64-bit state in
+// decimal. Writing or touching the file posts the name. So a shell, or any process with rights on the directory, can
+// post, and a name's state lasts.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -20,11 +18,11 @@ namespace platform {
 class LinuxNotifications final : public Notifications {
 public:
     // Statuses other than 0.
-    static constexpr NotificationStatus invalidName = 1; // cannot be the name of a file there
+    static constexpr NotificationStatus invalidName = 1; // not a valid file name
     static constexpr NotificationStatus unknownToken = 2;
-    static constexpr NotificationStatus noState = 3; // there is no such file, or it holds no number
+    static constexpr NotificationStatus noState = 3; // the file is missing, or does not hold a number
 
-    // The directory is made if it is missing, for nobody but its owner to write. With no directory nothing has a state,
+    // Makes the directory if it is missing; only its owner may write there. Without a directory no name has a state,
     // and only `post` posts.
     LinuxNotifications(std::filesystem::path directory, ConfigurationWatcher& watcher, ProviderLog log);
 
@@ -46,8 +44,8 @@ private:
 
     const std::filesystem::path directory_;
     mutable foundation::Mutex lock_;
-    std::vector<Registered> registered_ KESTO_GUARDED_BY(lock_); // the token is the place, from 1
-    std::unique_ptr<ConfigurationWatcher::Watch> watch_; // ends first
+    std::vector<Registered> registered_ KESTO_GUARDED_BY(lock_); // the token is the index, from 1
+    std::unique_ptr<ConfigurationWatcher::Watch> watch_; // destroyed first
 };
 
 } // namespace platform

@@ -1,5 +1,5 @@
-// Only of a domain whose values are known can be told whether they changed; so whoever wants to be told has all
-// files read that are there, and everything else is read when it is asked for.
+// To notice a change the provider must know the earlier values. So a change handler makes it read all existing files;
+// all other files are read on demand.
 #include "platform/linux/settings/LinuxPreferences.h"
 
 #include <algorithm>
@@ -11,7 +11,7 @@ namespace {
 constexpr std::string_view extension = ".toml";
 constexpr std::size_t longestFileName = 255;
 
-// The domain that a file of that name holds, or nothing.
+// The domain of a file of that name, or nothing.
 std::optional<std::string_view> domainOf(std::string_view fileName)
 {
     if (!fileName.ends_with(extension))
@@ -64,11 +64,11 @@ void LinuxPreferences::setChangeHandler(ChangeHandler handler)
 {
     const foundation::Lock lock(lock_);
     changeHandler_ = std::move(handler);
-    for (const std::string& domain : domainsThatAreThere()) // only of what is known can be told whether it changed
+    for (const std::string& domain : domainsThatAreThere()) // changes are noticed only against known values
         reload(domain);
 }
 
-// Whether the values of the domain are others than before; false for one of which nobody wants to know.
+// Whether the domain's values changed; false for a domain that is not kept in memory.
 bool LinuxPreferences::reload(const std::string& domain)
 {
     auto known = files_.find(domain);

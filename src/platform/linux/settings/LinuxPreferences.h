@@ -18,23 +18,23 @@ namespace platform {
 // Any thread.
 class LinuxPreferences final : public Preferences {
 public:
-    // Files of that many domains are kept in memory; those of others are read each time, and changes in them are
-    // not told.
+    // Files of this many domains are kept in memory; those of other domains are read each time, and their changes are
+    // not reported.
     static constexpr std::size_t mostKeptDomains = 64;
 
     using ChangeHandler = std::function<void(std::string_view domain)>;
 
     LinuxPreferences(ConfigurationWatcher& watcher, ProviderLog log);
 
-    // The last good value. A name that cannot be a domain (`isDomainName`) has none.
+    // The last good value; nothing for a name that is not a valid domain (`isDomainName`).
     [[nodiscard]] std::optional<foundation::Value> value(std::string_view domain, std::string_view key) const override;
 
-    // From now on the handler is called, on the watcher's thread, with each domain in which a value changed, came
-    // or went. At most once in the life of this object.
+    // From now on calls the handler, on the watcher's thread, with each domain in which a value changed, came or went.
+    // Call it at most once.
     void setChangeHandler(ChangeHandler handler);
 
-    // Letters, digits, "-", "_" and ".", not beginning with ".", and short enough for the name of a file: such a
-    // name cannot lead out of the directory.
+    // Letters, digits, "-", "_" and ".", not beginning with ".", and short enough for a file name: such a name cannot
+    // lead out of the directory.
     [[nodiscard]] static bool isDomainName(std::string_view name) noexcept;
 
 private:
@@ -48,7 +48,7 @@ private:
     mutable foundation::Mutex lock_;
     mutable std::map<std::string, TomlFile, std::less<>> files_ KESTO_GUARDED_BY(lock_); // by domain
     ChangeHandler changeHandler_ KESTO_GUARDED_BY(lock_);
-    std::unique_ptr<ConfigurationWatcher::Watch> watch_; // ends first
+    std::unique_ptr<ConfigurationWatcher::Watch> watch_; // destroyed first
 };
 
 } // namespace platform

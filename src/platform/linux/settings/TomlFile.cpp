@@ -1,5 +1,4 @@
-// The only file that sees toml++, which is large and slow to compile, and has to be kept from what it takes for
-// impossible.
+// The only file that includes toml++, which is large and slow to compile, and whose wrong assertions need a workaround.
 #include "platform/linux/settings/TomlFile.h"
 
 #include "platform/linux/files/SmallFile.h"
@@ -7,9 +6,10 @@
 #include <chrono>
 #include <sstream>
 
-// What toml++ 3.3 holds to be impossible is not: "[.a]" breaks an assertion, which release builds make a promise to
-// the compiler, and a letter beyond ASCII in a key is looked up in a table that is said to have it. What follows
-// finds the error in either case, so it is let: nothing is asserted, and what the table lacks is no blank.
+// toml++ 3.3 asserts conditions that can fail: "[.a]" breaks an assertion, which release builds turn into a promise to
+// the compiler, and a letter beyond ASCII in a key is looked up in a table that may lack it. In both cases the later
+// code of toml++ finds the error. So assertions are switched off, and a character that the table lacks does not count
+// as a blank.
 #undef NDEBUG
 #define TOML_ASSERT(condition) static_cast<void>(0)
 #define TOML_EXCEPTIONS 0
@@ -96,19 +96,19 @@ bool TomlFile::reload()
 {
     Content content = readSmallFile(path_, largest);
     if (!content && content.error() == std::errc::no_such_file_or_directory)
-        content = std::string(); // says as much as an empty file
+        content = std::string(); // a missing file counts as empty
     if (content == seen_)
         return false;
     seen_ = std::move(content);
     if (!seen_) {
-        log_.error("{} cannot be read: {}; what it said before stays in force", path_.native(),
+        log_.error("{} cannot be read: {}; its earlier content stays in force", path_.native(),
                    seen_.error().message());
         return false;
     }
     auto parsed = parseToml(*seen_);
     if (!parsed) {
         const TomlError& error = parsed.error();
-        log_.error("{}:{}:{}: {}; what the file said before stays in force until this is corrected", path_.native(),
+        log_.error("{}:{}:{}: {}; the file's earlier content stays in force until this is corrected", path_.native(),
                    error.line, error.column, error.reason);
         return false;
     }

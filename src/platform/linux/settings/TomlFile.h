@@ -1,7 +1,7 @@
 // One TOML file of the configuration, and the last good values that it held.
 //
-// Whoever edits a file may break it for a while. What it said before then stays in force, and one line of the
-// log says where it is broken.
+// A person who edits a file may break it for a while. Its earlier content then stays in force, and one log line names
+// the place of the error.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -16,15 +16,15 @@
 
 namespace platform {
 
-// Where a text stops being TOML, from 1, and why.
+// The place of an error in a TOML text, from 1, and its reason.
 struct TomlError {
     unsigned line = 0;
     unsigned column = 0;
     std::string reason;
 };
 
-// TOML 1.0 as values, tables in the order of their keys. A date, with or without time, is a `Date`, in UTC when
-// it names no offset; a time of day without a date belongs to no moment and stays text. Any thread.
+// TOML 1.0 as values, tables in the order of their keys. A date, with or without time, is a `Date`, in UTC unless it
+// names an offset; a time of day without a date stays text. Any thread.
 [[nodiscard]] std::expected<foundation::Dictionary, TomlError> parseToml(std::string_view text);
 
 // One thread at a time.
@@ -34,8 +34,8 @@ public:
 
     TomlFile(std::filesystem::path path, ProviderLog log) : path_(std::move(path)), log_(log) { }
 
-    // Reads the file; true when its values are now others. A file that is not there has no values; one that
-    // cannot be read or is no TOML keeps those it had, and is complained about once.
+    // Reads the file; true if its values changed. A missing file has no values; a file that cannot be read or is not
+    // TOML keeps its earlier values, and the error is logged once.
     bool reload();
 
     [[nodiscard]] const foundation::Dictionary& values() const noexcept { return values_; }
@@ -48,7 +48,7 @@ private:
 
     std::filesystem::path path_;
     ProviderLog log_;
-    Content seen_; // what `values_` was made of, or what is wrong with the file now
+    Content seen_; // the content of `values_`, or the present error of the file
     foundation::Dictionary values_;
 };
 

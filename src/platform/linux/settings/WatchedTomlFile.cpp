@@ -1,4 +1,4 @@
-// Watched first and read then, so that no change falls in between.
+// Watches first and then reads, so that no change is missed in between.
 #include "platform/linux/settings/WatchedTomlFile.h"
 
 namespace platform {

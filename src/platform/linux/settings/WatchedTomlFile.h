@@ -1,5 +1,4 @@
-// A TOML file of the configuration directory whose values are at hand at any time, and always those that it
-// last held in good order.
+// A TOML file of the configuration directory; its last good values are available at any time.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -15,7 +14,7 @@ namespace platform {
 // Any thread.
 class WatchedTomlFile {
 public:
-    // Called on the watcher's thread when the values are others; with none of this class's locks held.
+    // Called on the watcher's thread when the values have changed, without holding locks of this class.
     using ChangeHandler = std::function<void()>;
 
     // Reads the file before it returns.
@@ -32,7 +31,7 @@ private:
     const ChangeHandler changeHandler_;
     mutable foundation::Mutex lock_;
     TomlFile file_ KESTO_GUARDED_BY(lock_);
-    std::unique_ptr<ConfigurationWatcher::Watch> watch_; // ends first
+    std::unique_ptr<ConfigurationWatcher::Watch> watch_; // destroyed first
 };
 
 } // namespace platform

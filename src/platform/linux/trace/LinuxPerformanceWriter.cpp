@@ -1,4 +1,4 @@
-// Records gather in memory and go to the file in large pieces.
+// The writer collects records in memory and writes them in large pieces.
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
 
 #include "foundation/text/Format.h"
@@ -12,7 +12,7 @@ namespace {
 std::string jsonText(std::string_view text)
 {
     std::string json;
-    (void)foundation::appendJson(foundation::Value(text), json); // of text there is always one
+    (void)foundation::appendJson(foundation::Value(text), json); // text always has a JSON form
     return json;
 }
 
@@ -61,7 +61,7 @@ public:
         if (std::isfinite(value))
             foundation::Number(value).appendText(text_);
         else
-            text_ += "null"; // JSON has no word for it
+            text_ += "null"; // JSON cannot express it
         text_.append(R"(,"unit":")").append(nameOf(unit)).append("\"}");
         room_ -= text_.size() - before;
         if (text_.size() >= large) {
@@ -74,7 +74,7 @@ public:
     {
         remarks_.append(",").append(jsonText(key)).append(":");
         if (!foundation::appendJson(value, remarks_))
-            remarks_ += "null"; // JSON has no word for it
+            remarks_ += "null"; // JSON cannot express it
     }
 
 private:
@@ -100,14 +100,14 @@ private:
         nameText_ = jsonText(name);
     }
 
-    static constexpr std::size_t mostBesideName = 64; // bytes of a record
+    static constexpr std::size_t mostBesideName = 64; // bytes of a record besides its name
 
     const std::unique_ptr<AtomicFile> file_;
     const std::filesystem::path path_;
     const ProviderLog log_;
     std::size_t room_; // bytes that records may still take
     std::uint64_t lost_ = 0;
-    std::string text_; // not written yet
+    std::string text_; // records that are not written yet
     std::string remarks_;
     std::string name_;
     std::string nameText_; // as it stands in the file
@@ -121,7 +121,7 @@ std::unique_ptr<PerformanceFile> LinuxPerformanceWriter::open(const std::filesys
 {
     std::error_code ignored;
     if (std::filesystem::is_directory(std::filesystem::symlink_status(path, ignored))) {
-        log_.error("{} is a directory: remove it", path.native()); // a file could not take its place
+        log_.error("{} is a directory: remove it", path.native()); // a file cannot replace it
         return nullptr;
     }
     auto file = files_.createAtomically(path);

@@ -5,9 +5,9 @@
 //     {"name":"mix","value":190125,"unit":"ns"}
 //     ],"lostEvents":0,"lostValues":0}
 //
-// A record stands in a line of its own and says all that there is to know about it. Remarks stand behind them, where
-// all is known: the last one is how many records there was no room for. The file takes its place when it is
-// complete: whoever reads it sees the last one or this one, and never half of it.
+// Each record has a line of its own with all its data. Remarks follow the records, when their values are known: the
+// last is the number of records for which there was no room. The file gets its name when it is complete: a reader sees
+// the earlier or the new file, and never an unfinished one.
 #pragma once
 
 #include "platform/FileSystem.h"
@@ -16,13 +16,13 @@
 
 namespace platform {
 
-// Any thread; a file, one at a time.
+// Any thread; one thread at a time for each file.
 class LinuxPerformanceWriter final : public PerformanceWriter {
 public:
     // In bytes. Clients choose the names, and may choose long ones.
     static constexpr std::size_t largestFile = std::size_t{256} << 20;
 
-    // Paths are those of the file system, which outlives the writer and its files.
+    // Paths are those of `files`, which must outlive the writer and its files.
     LinuxPerformanceWriter(FileSystem& files, ProviderLog log, std::size_t largest = largestFile)
         : files_(files),
           log_(log),
@@ -30,8 +30,8 @@ public:
     {
     }
 
-    // Says in the log why a file cannot be opened, and when it is closed, what was lost: records that would have made
-    // it too large, or all of it on a full disk.
+    // Logs the reason if a file cannot be opened, and logs losses when it is closed: records that would have made it
+    // too large, or the whole file on a full disk.
     [[nodiscard]] std::unique_ptr<PerformanceFile> open(const std::filesystem::path& path, std::string_view project,
                                                         std::uint32_t version) override;
 

@@ -1,5 +1,5 @@
-// Events are picked here and handed over as one item of the session's queue for each step of the trace; how many are
-// on their way is bounded, since that queue may be slow.
+// For each step of the trace every session gets its events as one item of its queue; the number of events on their way
+// is bounded, because that queue may be slow.
 #include "platform/linux/trace/TraceFanOut.h"
 
 #include <algorithm>

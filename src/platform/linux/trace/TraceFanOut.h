@@ -1,7 +1,7 @@
-// Who wants which events of the one trace: every session gets those of its codes and its time, on its own queue, and is
-// told when it has got them all.
+// Distributes the events of the one trace: every session gets the events of its codes and its time on its own queue,
+// and then its completion.
 //
-// No thread, no clock and no file here: whoever has the trace says how far it has come.
+// It has no thread, clock or file of its own: its owner says how far the trace has come.
 #pragma once
 
 #include "platform/KernelTrace.h"
@@ -19,8 +19,8 @@
 
 namespace platform {
 
-// One session. Filled in before it is added; its times are changed under the lock of whoever has the fan-out. It is
-// shared with the queue, on which it may be met when the session itself is gone.
+// One session. It is filled in before it is added; its times change under the lock of the fan-out's owner. The queue
+// shares it and may use it after the session itself was destroyed.
 struct TraceSubscription {
     static constexpr std::uint64_t never = std::numeric_limits<std::uint64_t>::max();
 
@@ -34,11 +34,11 @@ struct TraceSubscription {
     std::vector<Filter> filters;
     std::function<void()> completion;
     std::shared_ptr<WorkQueue> queue;
-    bool hasWallTimes = false; // wants them
-    std::uint64_t startTime = never; // the first moment that belongs to it
+    bool hasWallTimes = false; // events carry the wall-clock time
+    std::uint64_t startTime = never; // the first moment of the session
     std::uint64_t endTime = never; // the last one
-    std::uint64_t lost = 0; // events; perhaps none of them its own
-    std::atomic<bool> isDestroyed = false; // nothing more is to be delivered
+    std::uint64_t lost = 0; // events, including those of other sessions
+    std::atomic<bool> isDestroyed = false; // nothing more may be delivered
 
     [[nodiscard]] bool hasStarted() const noexcept { return startTime != never; }
     [[nodiscard]] bool hasEnded() const noexcept { return endTime != never; }
@@ -47,29 +47,29 @@ struct TraceSubscription {
 // One thread at a time.
 class TraceFanOut {
 public:
-    // How many sessions there are at most, and how many events, copies counted, may be on their way to queues that are
-    // behind; those beyond are lost.
+    // The greatest numbers of sessions and of events on their way to slow queues (each copy counts); further events are
+    // lost.
     static constexpr std::size_t mostSessions = 256;
     static constexpr std::size_t mostOnTheirWay = 1'000'000;
 
     explicit TraceFanOut(ProviderLog log) : log_(log) { }
 
-    // False when there are too many.
+    // False if there are too many.
     [[nodiscard]] bool add(std::shared_ptr<TraceSubscription> subscription);
     void remove(const TraceSubscription& subscription);
 
     [[nodiscard]] bool isEmpty() const noexcept { return subscriptions_.empty(); }
-    // Whether somebody still wants what happens from now on.
+    // Whether a session still needs events from now on.
     [[nodiscard]] bool isWanted() const noexcept;
-    // The earliest end of those that have ended and are not completed; TraceSubscription::never without one.
+    // The earliest end of the sessions that have ended and are not completed; TraceSubscription::never without one.
     [[nodiscard]] std::uint64_t nextEnd() const noexcept;
 
-    // How many nanoseconds the wall clock is ahead of the trace's, for what is delivered from now on.
+    // By how many nanoseconds the wall clock is ahead of the trace's clock, for events that are delivered from now on.
     void setWallClock(std::int64_t ahead) noexcept { wallClockAhead_ = ahead; }
-    // Delivers events, which are in the order of time. Up to `doneUpTo` there will not be any more: sessions that ended
-    // by then are completed, and leave. What was lost meanwhile counts for all.
+    // Delivers events, which are in the order of time. No further events up to `doneUpTo` will come: sessions that
+    // ended by then are completed and removed. `lost` events count for all sessions.
     void deliver(std::span<const TracedMarker> events, std::uint64_t doneUpTo, std::uint64_t lost);
-    // Has a session told that it is complete. `deliver` does it for all that were added.
+    // Calls a session's completion on its queue. `deliver` does this for all added sessions.
     void complete(const std::shared_ptr<TraceSubscription>& subscription) const;
 
 private:

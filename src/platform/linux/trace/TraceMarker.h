@@ -1,5 +1,5 @@
-// What the service and its clients agree on, beside the wire protocol, to emit events into the kernel's trace: the
-// bytes of one event, and the page that says whether anybody wants them. Plain memory in the machine's own byte order.
+// The interface between service and clients for events in the kernel's trace, besides the wire protocol: the bytes of
+// one event, and the page that shows whether a trace runs. Plain memory in the machine's own byte order.
 #pragma once
 
 #include <array>
@@ -10,7 +10,7 @@ namespace platform {
 
 // One event, as it is written to the marker in one piece. The kernel adds time, thread and processor.
 struct TraceMarkerRecord {
-    static constexpr std::uint32_t ownTag = 0x4F54534B; // the bytes "KSTO"; what else is in the trace is not ours
+    static constexpr std::uint32_t ownTag = 0x4F54534B; // the bytes "KSTO"; records without it are foreign
 
     std::uint32_t tag = ownTag;
     std::uint32_t code = 0;
@@ -18,11 +18,11 @@ struct TraceMarkerRecord {
 };
 static_assert(sizeof(TraceMarkerRecord) == 40);
 
-// The shared page. Only the service writes to it; whoever reads it may see the change a moment later.
+// The shared page. Only the service writes to it; a reader may see a change a moment later.
 struct TraceMarkerPage {
     static constexpr std::size_t size = 4096; // of the file; all but the first field is 0 and reserved
 
-    std::uint32_t isTracing = 0; // 0: nobody wants events
+    std::uint32_t isTracing = 0; // 0: no trace runs
 };
 
 } // namespace platform

@@ -1,5 +1,5 @@
-// The page is a sealed memory file: the service maps it for writing first, and the seal then forbids that to
-// everybody who comes later. Nobody is answered under the lock.
+// The page is a sealed memory file: the service maps it for writing first, and the seal then forbids all later writable
+// mappings. Answers are given without the lock.
 #include "platform/linux/trace/TraceMarkerAccess.h"
 
 #include "platform/linux/files/SystemError.h"
@@ -44,7 +44,7 @@ void TraceMarkerAccess::forget(const void* asker)
     waiting_.erase(asker);
 }
 
-// The service's own mapping is made before the seal that forbids all later ones to write.
+// The service makes its own mapping before the seal, which forbids later writable mappings.
 std::error_code TraceMarkerAccess::open(int marker)
 {
     constexpr int seals = F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_FUTURE_WRITE | F_SEAL_SEAL;

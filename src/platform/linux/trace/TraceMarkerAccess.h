@@ -1,9 +1,9 @@
-// How clients come to emit events themselves: the service hands them the marker of its trace, open for writing, and the
-// page that says whether anybody traces.
+// Lets clients emit events: the service gives them the marker of its trace, open for writing, and the page that shows
+// whether a trace runs.
 //
-// A client that asks is answered when there is something to hand out, which is when somebody traces for the first time:
-// until then, and where nobody ever does, asking costs next to nothing. What a client then has cannot be turned against
-// others: of the marker it has the writing end alone, and the page's file is sealed against everything but reading.
+// A client that asks gets the answer when the first trace starts; until then a request costs almost nothing. A client
+// cannot harm others with these descriptors: it has only the writing end of the marker, and the page's file is sealed
+// against everything but reading.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -16,7 +16,7 @@
 
 namespace platform {
 
-// What is handed out. They stay open as long as the service.
+// The descriptors for clients. They stay open as long as the service runs.
 struct TraceDescriptors {
     int marker = -1;
     int page = -1; // TraceMarkerPage
@@ -32,13 +32,14 @@ public:
     TraceMarkerAccess(const TraceMarkerAccess&) = delete;
     TraceMarkerAccess& operator=(const TraceMarkerAccess&) = delete;
 
-    // Answers once: now or from `open`, or never if the asker is forgotten before.
+    // Answers once: now or in `open`, or never if the asker is forgotten before.
     void ask(const void* asker, Answer answer);
     void forget(const void* asker);
 
-    // There is a marker, which stays open as long as this lives: makes the page and answers all who wait. Once.
+    // Sets the marker, which must stay open as long as this object lives; makes the page and answers all waiting
+    // askers. Call it once.
     [[nodiscard]] std::error_code open(int marker);
-    // Writes to the page whether somebody traces; without a page it does nothing.
+    // Writes to the page whether a trace runs; without a page it does nothing.
     void setTracing(bool isTracing) noexcept;
 
 private:

@@ -1,5 +1,5 @@
-// Processors are streams that are in order by themselves, so that ordering all of them is merging neighbours: as
-// good as nothing where one processor does all the work.
+// Each processor's stream is in order, so merging neighbouring streams orders all of them; this costs almost nothing if
+// one processor does all the work.
 #include "platform/linux/trace/TraceMerger.h"
 
 #include <algorithm>
@@ -8,7 +8,7 @@
 namespace platform {
 namespace {
 
-// A record: the kernel's type (2 bytes) and thread (4), then what was written to the marker.
+// A record: the kernel's type (2 bytes) and thread (4), then the bytes that were written to the marker.
 constexpr std::size_t threadOffset = 4;
 constexpr std::size_t markerOffset = 8;
 constexpr std::size_t recordSize = markerOffset + sizeof(TraceMarkerRecord);
@@ -73,7 +73,7 @@ std::span<const TracedMarker> TraceMerger::eventsUpTo(std::uint64_t time)
     return merged_;
 }
 
-// Half as many runs; one without a neighbour stays as it is.
+// Halves the number of runs; a run without a neighbour stays as it is.
 void TraceMerger::mergeNeighbours()
 {
     merging_.resize(merged_.size());

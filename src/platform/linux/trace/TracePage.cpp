@@ -1,5 +1,5 @@
-// Every length is held against what is left before it is believed; the first that does not fit ends the page, for
-// nothing behind it can be told apart any more.
+// Every length is checked against the rest of the page; the first that does not fit ends the page, because the records
+// behind it cannot be found any more.
 #include "platform/linux/trace/TracePage.h"
 
 namespace platform {
@@ -40,7 +40,7 @@ TracePageReader::TracePageReader(std::span<const std::byte> page, const TracePag
     missedEvents_ = isCounted ? numberAt(data, size, format.commitSize) : 1;
 }
 
-// A record of more than 28 words has its length, that of the length itself included, in a word of its own.
+// A record of more than 28 words has its length in a word of its own; the length includes that word.
 std::optional<TraceRecord> TracePageReader::takeLongRecord() noexcept
 {
     if (!holds(2))
@@ -53,7 +53,7 @@ std::optional<TraceRecord> TracePageReader::takeLongRecord() noexcept
     return takeRecord(2 * wordSize, length - wordSize);
 }
 
-// Without a time, nothing but padding follows; with one, it stands where an event was taken back.
+// Without a time, only padding follows; with a time, it replaces an event that was taken back.
 void TracePageReader::skipPadding(std::uint32_t delta) noexcept
 {
     if (delta == 0) {

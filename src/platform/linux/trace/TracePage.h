@@ -1,9 +1,8 @@
-// A page of the kernel's trace, taken apart. The kernel hands the events of one processor out in pages, in the binary
-// form in which it keeps them: a time, the number of bytes that follow, and records, each with the time that passed
-// since the one before.
+// Reads a page of the kernel's trace. The kernel returns the events of one processor in pages, in its own binary form:
+// a time, the number of bytes that follow, and records, each with the time since the record before.
 //
-// Here they are plain bytes, so that pages can be recorded, made by hand, and fuzzed: whatever stands in one, reading
-// it stays inside it and ends.
+// The reader takes plain bytes, so that pages can be recorded, made by hand, and fuzzed: for any bytes it stays inside
+// the page and ends.
 #pragma once
 
 #include <cstddef>
@@ -14,7 +13,7 @@
 
 namespace platform {
 
-// Where things stand in a page, which depends on the size of the kernel's `long` (events/header_page).
+// The layout of a page, which depends on the size of the kernel's `long` (events/header_page).
 struct TracePageFormat {
     static constexpr std::size_t commitOffset = 8;
 
@@ -35,21 +34,22 @@ struct TraceRecord {
     std::span<const std::byte> bytes; // from the record's type on; valid as long as the page
 };
 
-// Goes through one page. One thread; the page stays where it is meanwhile.
+// Reads one page, which must stay valid meanwhile. One thread.
 class TracePageReader {
 public:
     TracePageReader(std::span<const std::byte> page, const TracePageFormat& format);
 
-    // The next record, or nothing at the page's end or where the page makes no sense any more.
+    // The next record, or nothing at the page's end or where the page is broken.
     [[nodiscard]] std::optional<TraceRecord> next();
 
-    // Events that were lost before this page, for want of room; 1 when the kernel does not say how many.
+    // The number of events that were lost before this page because the buffer was full; 1 if the kernel does not report
+    // the number.
     [[nodiscard]] std::uint64_t missedEvents() const noexcept { return missedEvents_; }
-    // Whether something in it cannot be; what stood before that was read. After the last record.
+    // Whether the page is broken; the records before the error were read. Call it after the last record.
     [[nodiscard]] bool isBroken() const noexcept { return isBroken_; }
 
 private:
-    // What the five lowest bits of a record's head say. Below, they are the length in words.
+    // Values of the five lowest bits of a record's head. Other values are the length in words.
     enum Kind : std::uint32_t { LongRecord = 0, Padding = 29, TimeExtend = 30, TimeStamp = 31 };
     static constexpr std::size_t wordSize = 4;
     static constexpr unsigned kindBits = 5;
@@ -75,7 +75,7 @@ private:
     bool isBroken_ = false;
 };
 
-// Inline: it is what all the time is spent with.
+// Inline, because nearly all the time is spent here.
 inline std::optional<TraceRecord> TracePageReader::next()
 {
     while (!rest_.empty() && holds(1)) {

@@ -1,6 +1,6 @@
-// An event on its way from the kernel's pages to the sessions. Putting events in order is copying them a few times, so
-// here they are no larger than what there is to know of them: what sessions get, KernelTraceEvent, has room for much
-// that this system does not tell, and is made for each session when it gets the event.
+// An event on its way from the kernel's pages to the sessions. Ordering copies events a few times, so this type holds
+// only the fields of this system. The larger KernelTraceEvent, with fields of other systems, is made for each session
+// when it gets the event.
 #pragma once
 
 #include "platform/linux/trace/TraceMarker.h"

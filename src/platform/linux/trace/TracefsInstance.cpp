@@ -1,5 +1,5 @@
-// tracefs speaks text, and what it says differs between kernels: what this service relies on is read and compared
-// before the first event, rather than found out from events that make no sense.
+// tracefs describes its formats as text, which differs between kernels: the service compares the parts that it relies
+// on before the first event, so that it does not read events in a wrong format.
 #include "platform/linux/trace/TracefsInstance.h"
 
 #include "platform/linux/files/FilesAt.h"
@@ -31,7 +31,7 @@ TracefsFailure failure(const fs::path& path, std::string_view problem, int error
 
 std::unexpected<TracefsFailure> unexpectedFormat(const fs::path& path)
 {
-    return std::unexpected(TracefsFailure{.what = path.native() + " is not as this service knows it"});
+    return std::unexpected(TracefsFailure{.what = path.native() + " has another form than this service expects"});
 }
 
 // In the table of mounts, blanks and the like stand as three octal digits.
@@ -72,7 +72,7 @@ int writeAt(const FileDescriptor& directory, const char* name, std::size_t numbe
     return writeAt(directory, name, std::to_string(number));
 }
 
-// The number behind the first of these words; nothing when there is none.
+// The number behind the first of these words; nothing if it is missing.
 std::optional<std::size_t> numberBehind(std::string_view text, std::string_view word)
 {
     const std::size_t place = text.find(word);
@@ -85,7 +85,7 @@ std::optional<std::size_t> numberBehind(std::string_view text, std::string_view 
     return number;
 }
 
-// How many bytes the kernel hands out at once.
+// How many bytes the kernel returns at once.
 std::size_t pageSize(const fs::path& instance)
 {
     constexpr std::size_t most = 1024; // kilobytes
@@ -124,7 +124,7 @@ std::expected<TracefsInstance, TracefsFailure> TracefsInstance::open(const fs::p
     if (!instance.directory_)
         return std::unexpected(failure(path, "cannot be opened", errno));
     if (::flock(instance.directory_.get(), LOCK_EX | LOCK_NB) != 0)
-        return std::unexpected(TracefsFailure{.what = path.native() + " belongs to another service that runs",
+        return std::unexpected(TracefsFailure{.what = path.native() + "is in use by another running service",
                                               .isInUse = errno == EWOULDBLOCK});
     if (const auto done = instance.setUp(path); !done)
         return std::unexpected(done.error());
@@ -133,8 +133,8 @@ std::expected<TracefsInstance, TracefsFailure> TracefsInstance::open(const fs::p
 
 std::expected<void, TracefsFailure> TracefsInstance::setUp(const fs::path& path)
 {
-    // Times are those of CLOCK_MONOTONIC, in nanoseconds. To change the clock also drops all that is in the buffer, but
-    // only to change it: so what a service left behind is dropped by opening `trace` for writing.
+    // Times are those of CLOCK_MONOTONIC, in nanoseconds. Setting the clock empties the buffer only if the clock
+    // changes; opening `trace` for writing drops the events of an earlier service in any case.
     for (const auto& [name, text] : {std::pair{"tracing_on", "0"}, {"trace_clock", "mono"}, {"trace", ""}})
         if (const int error = writeAt(directory_, name, text); error != 0)
             return std::unexpected(failure(path / name, "cannot be written", error));
@@ -149,7 +149,7 @@ std::expected<void, TracefsFailure> TracefsInstance::setUp(const fs::path& path)
 
 std::expected<void, TracefsFailure> TracefsInstance::readFormats(const fs::path& path)
 {
-    // Files of the kernel whose size is not known before they are read.
+    // Kernel files, whose size is known only after reading.
     const auto read = [&](const char* name) {
         std::ostringstream text;
         text << std::ifstream(path / name).rdbuf();
@@ -199,10 +199,10 @@ std::expected<void, TracefsFailure> TracefsInstance::openPages(const fs::path& p
     return {};
 }
 
-// On a device with little memory a smaller buffer has to do.
+// On a device with little memory a smaller buffer is used.
 std::error_code TracefsInstance::switchOn()
 {
-    int error = writeAt(directory_, "trace", ""); // what came too late for those who traced before
+    int error = writeAt(directory_, "trace", ""); // drops events that came after the last trace
     if (error != 0)
         return {error, std::generic_category()};
     for (std::size_t size = kilobytesWhileOn; size >= fewestKilobytes; size /= 2) {
@@ -215,7 +215,7 @@ std::error_code TracefsInstance::switchOn()
     return {error, std::generic_category()};
 }
 
-// Nothing can be done when it fails, and nothing depends on it.
+// Failures are ignored, because they cannot be repaired and have no effect.
 void TracefsInstance::switchOff()
 {
     static_cast<void>(writeAt(directory_, "tracing_on", "0"));

@@ -1,9 +1,9 @@
-// One ring buffer of the kernel's tracing, the service's own: made, set up, switched, and read through the files of
-// tracefs. Nothing that others trace on the machine is touched by it or seen in it.
+// One ring buffer of the kernel's tracing, which belongs to the service: made, set up, switched and read through the
+// files of tracefs. It does not touch other traces on the machine.
 //
-// A service that was killed leaves its instance behind, perhaps switched on and full of events; the next one takes it
-// over, empty. Whoever uses an instance holds a lock on its directory, which goes with the process: so no two services
-// read the same buffer. An instance is never removed, for clients hold its marker open.
+// A killed service leaves its instance behind, perhaps switched on and full of events; the next service empties it and
+// takes it over. A service that uses an instance holds a lock on its directory, which ends with the process: so two
+// services never read the same buffer. An instance is never removed, because clients hold its marker open.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -19,19 +19,19 @@
 
 namespace platform {
 
-// Where tracefs is mounted, by a file of the form of /proc/self/mounts; /sys/kernel/tracing before other places.
+// The mount point of tracefs, from a file of the form of /proc/self/mounts; /sys/kernel/tracing is preferred.
 [[nodiscard]] std::optional<std::filesystem::path> findTracefs(const std::filesystem::path& mounts);
 
-// What cannot be done, for the log.
+// A failure, for the log.
 struct TracefsFailure {
     std::string what; // such as "/sys/kernel/tracing/instances/kesto cannot be made: Read-only file system"
-    bool isInUse = false; // another process has the instance
+    bool isInUse = false; // another process uses the instance
 };
 
 // One thread at a time.
 class TracefsInstance {
 public:
-    // What a processor's buffer holds while there is a trace, 150,000 events or so, and what it shrinks to afterwards.
+    // The size of a processor's buffer while a trace runs, about 150,000 events, and afterwards.
     static constexpr std::size_t kilobytesWhileOn = 8192;
     static constexpr std::size_t fewestKilobytes = 256; // less is not worth a trace
     static constexpr std::size_t kilobytesWhileOff = 4;
@@ -42,17 +42,17 @@ public:
     [[nodiscard]] static std::expected<TracefsInstance, TracefsFailure> open(const std::filesystem::path& tracefs,
                                                                              const std::string& name);
 
-    // What events are written to: TraceMarkerRecord.
+    // The descriptor to which events are written as TraceMarkerRecord.
     [[nodiscard]] int marker() const noexcept { return marker_.get(); }
     [[nodiscard]] const TracePageFormat& pageFormat() const noexcept { return pageFormat_; }
     // The type of the records that the marker makes.
     [[nodiscard]] std::uint16_t markerType() const noexcept { return markerType_; }
 
-    // Begins to keep what is written to the marker: some 20 ms. An instance that cannot stays off.
+    // Starts recording the marker's events, which takes some 20 ms. On failure the instance stays off.
     [[nodiscard]] std::error_code switchOn();
     void switchOff();
-    // Hands out all pages that are there, and of a processor no more than twice what its buffer holds: who writes
-    // faster than this reads cannot keep it from ending.
+    // Calls the handler with all present pages, for each processor at most twice the size of its buffer: so it ends
+    // even if a client writes faster than it reads.
     void readPages(const PageHandler& handle);
 
 private:

@@ -1,5 +1,5 @@
-// Sessions come and go on any thread, the reading thread looks at the buffers: one lock holds them apart, and events
-// are handed to the sessions' own queues.
+// Sessions come and go on any thread, and the reading thread reads the buffers: one lock protects the shared state, and
+// events go to the sessions' own queues.
 #include "platform/linux/trace/TracefsKernelTrace.h"
 
 #include "platform/linux/files/SystemError.h"
@@ -16,7 +16,7 @@ namespace {
 
 using Clock = TracefsKernelTrace::Clock;
 
-// A moment as the trace has it.
+// A moment on the trace's clock.
 std::uint64_t traceTime(Clock::time_point moment)
 {
     return static_cast<std::uint64_t>(std::chrono::nanoseconds(moment.time_since_epoch()).count());
@@ -27,7 +27,7 @@ Clock::time_point moment(std::uint64_t traceTime)
     return Clock::time_point(std::chrono::nanoseconds(traceTime));
 }
 
-// In nanoseconds. Looked at anew for every reading: it changes when the clock is set and when the machine has slept.
+// In nanoseconds. Measured for every reading, because it changes when the clock is set and when the machine has slept.
 std::int64_t wallClockAheadOfTrace()
 {
     const auto wall = std::chrono::system_clock::now().time_since_epoch();
@@ -59,7 +59,7 @@ public:
                          std::function<void(const KernelTraceEvent&)> handler) override
     {
         if (subscription_->queue)
-            return EBUSY; // it is started
+            return EBUSY; // already started
         if (firstCode > lastCode || !handler)
             return EINVAL;
         subscription_->filters.push_back({firstCode, lastCode, std::move(handler)});
@@ -76,7 +76,7 @@ public:
         return trace_.start(subscription_);
     }
 
-    // Even one that could not be started is completed: somebody waits for that.
+    // A session that could not start is completed, too, because its owner waits for that.
     void end() override
     {
         if (subscription_->queue)
@@ -144,7 +144,7 @@ bool TracefsKernelTrace::setUp()
     auto opened = openInstance();
     if (!opened) {
         if (opened.error().what != problem_)
-            log_.error("there is no kernel trace: {}", opened.error().what);
+            log_.error("the kernel trace is not available: {}", opened.error().what);
         problem_ = opened.error().what;
         return false;
     }
@@ -170,7 +170,7 @@ int TracefsKernelTrace::start(const std::shared_ptr<TraceSubscription>& subscrip
     return 0;
 }
 
-// The thread that reads begins with the first session.
+// Starts the reading thread with the first session.
 int TracefsKernelTrace::switchOn()
 {
     if (isOn_)
@@ -194,12 +194,12 @@ int TracefsKernelTrace::switchOn()
 void TracefsKernelTrace::switchOff()
 {
     isOn_ = false;
-    merger_.reset(); // and all memory that it took
+    merger_.reset(); // releases its memory
     instance_->switchOff();
     tellEmitters();
 }
 
-// Nobody is to pay for events that nobody gets.
+// Lets emitters skip events while no session needs them.
 void TracefsKernelTrace::tellEmitters()
 {
     const bool isTracing = isOn_ && fanOut_.isWanted();

@@ -1,16 +1,15 @@
-// The room of traces: events into the kernel's trace, out of it again, and the files of what was measured. It alone
-// touches tracefs.
+// The room of traces: emitting events into the kernel's trace, reading them, and writing the files of results. Only
+// this room uses tracefs.
 //
-// The kernel event trace service, on an instance of tracefs that is the service's own.
+// The kernel event trace service, with an instance of tracefs that belongs to the service.
 //
-// All sessions share the instance: there is one ring buffer a processor, which everybody who emits writes to, and each
-// session gets its part of what comes out of it. The buffers are read every few milliseconds by a thread of its own
-// while there is a session, rather than when the kernel says that something is in them: to be told so costs whoever
-// emits seven times what the event costs. Without a session the buffers are off, the thread sleeps, and nothing wakes
-// it.
+// All sessions share the instance: it has one ring buffer for each processor, to which all emitters write, and each
+// session gets its part of the events. While a session runs, a thread reads the buffers every few milliseconds. The
+// kernel could wake the thread for events instead, but this would make an event seven times as expensive for its
+// emitter. Without a session the buffers are off and the thread sleeps.
 //
-// An event is not delivered before the settling time is over, for until then one that is older may still come from
-// another processor. A session that ends is completed as soon as this time has passed since.
+// An event is delivered after the settling time, because until then an older event may still come from another
+// processor. A session is completed when this time has passed since its end.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -31,30 +30,30 @@
 
 namespace platform {
 
-// Where the trace is found; as it is for the service, unless a test says otherwise.
+// The place of the trace; the defaults are the service's, tests set others.
 struct TracefsPlace {
     std::filesystem::path mounts = "/proc/self/mounts";
     std::string instanceName = "kesto";
 };
 
-// Any thread. Its sessions go before it.
+// Any thread. Its sessions must be destroyed before it.
 class TracefsKernelTrace final : public KernelTrace {
 public:
     using Clock = std::chrono::steady_clock; // the clock of the trace
 
     static constexpr std::chrono::milliseconds readingPeriod{20};
     static constexpr std::chrono::milliseconds settlingTime{2};
-    // Services on one machine have an instance each: the second one of this name and "-2", and so on.
+    // Each service on a machine has an instance: the second service has this name with "-2", and so on.
     static constexpr int mostInstances = 8;
 
-    // The markers and the access are told when somebody traces.
+    // Notifies the markers and the access when a trace starts or ends.
     TracefsKernelTrace(TracefsPlace place, TracefsMarkers& markers, TraceMarkerAccess& access, ProviderLog log);
     ~TracefsKernelTrace() override;
     TracefsKernelTrace(const TracefsKernelTrace&) = delete;
     TracefsKernelTrace& operator=(const TracefsKernelTrace&) = delete;
 
-    // The first call of either sets the instance up, which takes some 30 ms. Why there is none is logged when it
-    // changes.
+    // The first call of either function sets up the instance, which takes some 30 ms. If this fails, the reason is
+    // logged whenever it changes.
     [[nodiscard]] bool isAvailable() override;
     [[nodiscard]] std::unique_ptr<KernelTraceSession> createTraceSession() override;
 
@@ -82,9 +81,9 @@ private:
 
     foundation::Mutex lock_;
     foundation::Condition changed_;
-    std::string problem_ KESTO_GUARDED_BY(lock_); // that was told
+    std::string problem_ KESTO_GUARDED_BY(lock_); // the last logged one
     std::optional<TracefsInstance> instance_ KESTO_GUARDED_BY(lock_);
-    std::optional<TraceMerger> merger_ KESTO_GUARDED_BY(lock_); // while it is on
+    std::optional<TraceMerger> merger_ KESTO_GUARDED_BY(lock_); // while the instance is on
     TraceFanOut fanOut_ KESTO_GUARDED_BY(lock_);
     Clock::time_point lastReading_ KESTO_GUARDED_BY(lock_);
     bool isOn_ KESTO_GUARDED_BY(lock_) = false;

@@ -1,4 +1,4 @@
-// One write, whose failure nobody could do anything about: an event that is not taken is one that was not seen.
+// One write, whose failure is ignored: the event is then lost.
 #include "platform/linux/trace/TracefsMarkers.h"
 
 #include "platform/linux/trace/TraceMarker.h"

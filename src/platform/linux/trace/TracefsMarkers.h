@@ -10,10 +10,10 @@ namespace platform {
 // Any thread.
 class TracefsMarkers final : public TraceMarkers {
 public:
-    // Costs a load and a branch when nobody traces. What the kernel does not take is nobody's loss.
+    // Costs a load and a branch while no trace runs. Failed writes are ignored.
     void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) override;
 
-    // From now on events are written to the marker, which stays open for as long as the process; -1: to none.
+    // From now on writes events to the marker, which must stay open as long as the process; -1 stops writing.
     void setMarker(int descriptor) noexcept { marker_.store(descriptor, std::memory_order_relaxed); }
 
 private:

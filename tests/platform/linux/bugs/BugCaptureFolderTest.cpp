@@ -1,4 +1,4 @@
-// The captures on a real disk: whole or not at all, never more than allowed, and never through a link.
+// The captures on a real disk: complete or missing, within the limits, and never through a link.
 #include "platform/linux/bugs/BugCaptureFolder.h"
 
 #include "support/TemporaryDirectory.h"
@@ -82,7 +82,7 @@ TEST_F(BugCaptureFolderTest, IsNotForOthersToRead)
         EXPECT_EQ(fs::status(path).permissions() & fs::perms::others_all, fs::perms::none) << path;
 }
 
-TEST_F(BugCaptureFolderTest, NumbersGoOnWhateverTheClockSaysAndAfterARestart)
+TEST_F(BugCaptureFolderTest, NumbersGoOnForAnyClockAndAfterARestart)
 {
     {
         BugCaptureFolder folder(state);
@@ -95,7 +95,7 @@ TEST_F(BugCaptureFolderTest, NumbersGoOnWhateverTheClockSaysAndAfterARestart)
     EXPECT_EQ(folder.nextName(noon), "00000003-20270115T080000Z");
 }
 
-TEST_F(BugCaptureFolderTest, ANumberIsNeverUsedAgainWhateverIsRemoved)
+TEST_F(BugCaptureFolderTest, ANumberIsNeverUsedAgainAfterCapturesAreRemoved)
 {
     {
         BugCaptureFolder folder(state);

@@ -1,5 +1,4 @@
-// What is read of processes and of the sound system, from trees such as the kernel shows and from such as it never
-// would.
+// The evidence of processes and of the sound system, from trees like the kernel's and from malformed ones.
 #include "platform/linux/bugs/BugEvidence.h"
 
 #include "platform/linux/process/LinuxProcessTable.h"
@@ -120,7 +119,7 @@ TEST_F(BugEvidenceTest, AFileThatCannotBeReadIsNull)
     EXPECT_EQ(*process.find("limits"), Value(Array{"Limit  Soft", "Max open files  1024"}));
 }
 
-TEST_F(BugEvidenceTest, ALinkInThePlaceOfAProcessIsNone)
+TEST_F(BugEvidenceTest, ALinkInThePlaceOfAProcessIsIgnored)
 {
     fs::create_directory(proc / "elsewhere");
     support::writeFile(proc / "elsewhere/comm", "player\n");
@@ -129,7 +128,7 @@ TEST_F(BugEvidenceTest, ALinkInThePlaceOfAProcessIsNone)
     EXPECT_EQ(*processEvidence(proc, "player").find("found"), Value(0));
 }
 
-TEST_F(BugEvidenceTest, BytesThatAreNoTextAreReplacedInNamesAsTheProcessTableDoes)
+TEST_F(BugEvidenceTest, BytesThatAreNotTextAreReplacedInNamesAsInTheProcessTable)
 {
     addProcess(7, "pl\xFFyer");
     support::writeFile(proc / "7/cmdline", "\xFF\xFE\0"s);

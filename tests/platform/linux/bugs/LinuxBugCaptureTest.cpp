@@ -1,4 +1,4 @@
-// The service as those who ask for snapshots see it: what they are told, when, and what is on the disk then.
+// The service as its callers see it: the replies, their times, and the files on the disk.
 #include "platform/linux/bugs/LinuxBugCapture.h"
 
 #include "platform/linux/log/LinuxLog.h"
@@ -45,10 +45,10 @@ protected:
     {
         return reporter.makeSignature("Sonalis", "haptics", "Playback", "Gimbo", process, std::nullopt);
     }
-    // Asks for a snapshot of the player; what is answered is kept.
+    // Requests a snapshot of the player and keeps the reply.
     void request(LinuxBugCapture& capture)
     {
-        const auto reporter = capture.makeReporter(); // gone before the snapshot is taken
+        const auto reporter = capture.makeReporter(); // destroyed before the snapshot is taken
         reporter->requestSnapshot(signature(*reporter), 0, std::nullopt, std::nullopt,
                                   [this](Dictionary response) { responses.push_back(std::move(response)); });
     }

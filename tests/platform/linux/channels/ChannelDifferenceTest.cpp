@@ -1,4 +1,4 @@
-// How channels changed: what is subtracted, what is not, and when a channel has begun anew.
+// Differences of channels: which values are subtracted, and when a channel has begun anew.
 #include "platform/linux/channels/ChannelDifference.h"
 
 #include <algorithm>
@@ -203,7 +203,8 @@ TEST(ChannelDifference, TellsChannelsApartByAllOfTheirNames)
     EXPECT_EQ(channels[3].value, 1);
 }
 
-// Whatever counters do, a difference is no more than what is there now, and adds up where nothing began anew.
+// For all changes of counters, a difference does not exceed the later value, and differences add up unless a channel
+// began anew.
 RC_GTEST_PROP(ChannelDifferenceProperty, NeverReportsMoreThanThereIs, ())
 {
     const auto counts = *rc::gen::container<std::vector<std::pair<std::uint32_t, std::uint32_t>>>(

@@ -1,4 +1,4 @@
-// The text of a channel's file: what it means, and what is refused.
+// The text of a channel's file: its meaning, and its errors.
 #include "platform/linux/channels/ChannelFile.h"
 
 #include <gmock/gmock.h>

@@ -1,4 +1,4 @@
-// Whose a channel is, and how that is told from what others may put in its place.
+// The owner of a channel, and files of other users in its place.
 #include "platform/linux/channels/ChannelOwner.h"
 #include "platform/linux/channels/ChannelTree.h"
 #include "support/TemporaryDirectory.h"
@@ -78,7 +78,7 @@ protected:
     {
         return makeChannelOwnerFile(openDriver(driver).get(), who);
     }
-    // The names of the channels that are there.
+    // The names of the existing channels.
     [[nodiscard]] std::vector<std::string> channels() const
     {
         const auto reading = ChannelTree(root).read({}).value();
@@ -96,12 +96,12 @@ protected:
 
 TEST_F(ChannelOwnerTest, AChannelIsThereAsLongAsItsOwnerFileIsLocked)
 {
-    EXPECT_THAT(channels(), IsEmpty()) << "there is no owner";
+    EXPECT_THAT(channels(), IsEmpty()) << "the owner file is missing";
     {
         const FileDescriptor owning = own();
         ASSERT_TRUE(owning);
         EXPECT_THAT(channels(), ElementsAre("owned"));
-        EXPECT_THAT(channels(), ElementsAre("owned")) << "whoever looks does not take the lock away";
+        EXPECT_THAT(channels(), ElementsAre("owned")) << "testing the lock does not release it";
     }
     EXPECT_TRUE(fs::exists(ownerFile));
     EXPECT_THAT(channels(), IsEmpty());
@@ -170,7 +170,7 @@ TEST_F(ChannelOwnerTest, AChannelIsThereWhereItsOwnerCannotBeLookedAt)
     }
     ASSERT_EQ(::chmod(ownerFile.c_str(), 0), 0);
     ASSERT_EQ(::chmod(directory.path().c_str(), 0755), 0);
-    if (::geteuid() == 0) { // who may read everything
+    if (::geteuid() == 0) { // root may read everything
         ASSERT_EQ(::seteuid(nobody), 0);
     }
     const auto seen = channels();

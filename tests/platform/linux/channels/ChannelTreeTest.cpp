@@ -1,4 +1,4 @@
-// The channel tree as it is meant, and as somebody hostile would have it.
+// A correct channel tree, and hostile ones.
 #include "platform/linux/channels/ChannelTree.h"
 #include "platform/linux/channels/ChannelFile.h"
 #include "support/TemporaryDirectory.h"
@@ -39,7 +39,7 @@ protected:
     {
         return ChannelTree(root).read(selection).value();
     }
-    // What is wrong with the only file beside one that is right.
+    // The problem of a wrong file beside a correct one.
     std::string_view onlyProblem()
     {
         publish("amp/Tx/-/right", "simple\n1\n");
@@ -53,7 +53,7 @@ protected:
     const fs::path root = directory.path() / "channels";
 };
 
-// --- what is there
+// --- existing channels
 
 TEST_F(ChannelTreeTest, TellsWhereAChannelStandsAndWhatItHolds)
 {
@@ -106,7 +106,7 @@ TEST_F(ChannelTreeTest, IsReadInTheOrderOfNames)
         ElementsAre(isChannel("z", 1), isChannel("B", 1), isChannel("a", 1), isChannel("b", 1), isChannel("c", 1)));
 }
 
-TEST_F(ChannelTreeTest, HoldsNothingWhereThereIsNoRoot)
+TEST_F(ChannelTreeTest, HoldsNothingWithoutARoot)
 {
     EXPECT_THAT(read().channels, IsEmpty());
     EXPECT_THAT(ChannelTree("").read({})->channels, IsEmpty());
@@ -161,7 +161,7 @@ TEST_F(ChannelTreeTest, LeavesOutFilesInThePlaceOfFolders)
     EXPECT_THAT(read().problems, IsEmpty());
 }
 
-// --- what is wrong costs that channel and no other
+// --- an error affects only its channel
 
 TEST_F(ChannelTreeTest, NamesAFileThatIsHalfWritten)
 {
@@ -249,7 +249,7 @@ TEST_F(ChannelTreeTest, NamesAFileThatItMayNotRead)
     publish("amp/Tx/-/closed", "simple\n1\n");
     ASSERT_EQ(::chmod((root / "amp/Tx/-/closed").c_str(), 0), 0);
     ASSERT_EQ(::chmod(directory.path().c_str(), 0755), 0);
-    if (::geteuid() == 0) { // who may read everything
+    if (::geteuid() == 0) { // root may read everything
         ASSERT_EQ(::seteuid(nobody), 0);
     }
     const ChannelReading reading = read();
@@ -263,7 +263,7 @@ TEST_F(ChannelTreeTest, NamesAChannelWhoseNameIsNotUtf8)
     EXPECT_EQ(onlyProblem(), "its name is not UTF-8");
 }
 
-// --- reading ends, however much there is
+// --- limits end every reading
 
 TEST_F(ChannelTreeTest, TakesSoManyChannelsAndCountsTheRest)
 {

@@ -1,5 +1,5 @@
-// The reporting channels of this system: what is published and what the kernel tells, found, sampled and compared as
-// the service does it.
+// The reporting channels of this system, published ones and the kernel's, found, sampled and compared as by the
+// service.
 #include "platform/linux/channels/LinuxReportingChannels.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
@@ -51,7 +51,7 @@ protected:
     LinuxReportingChannels channels{root, sound, ProviderLog(log)};
 };
 
-TEST_F(LinuxReportingChannelsTest, AreNoneOnADeviceWhereNobodyPublishes)
+TEST_F(LinuxReportingChannelsTest, AreMissingOnADeviceWithoutPublishers)
 {
     const auto found = channels.copyChannelsInGroup("Speaker", std::nullopt);
     EXPECT_EQ(found.error, std::nullopt);
@@ -146,7 +146,7 @@ TEST_F(LinuxReportingChannelsTest, NameTheBoundThatASampleMet)
                                    "4 names that it looks at")));
 }
 
-// What every question meets, as the service asks them when it starts.
+// A problem that every query of the starting service finds.
 TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
 {
     fs::create_directories(root);
@@ -229,7 +229,7 @@ TEST_F(LinuxReportingChannelsTest, AreAnErrorWhereTheTreeCannotBeReadAndNoSoundC
     EXPECT_EQ(channels.createSamples(*subscribed.subscription, *subscribed.channels).error(), ENOTDIR);
 }
 
-// That it is not in the first sample says nothing then: what it holds was not counted in between.
+// Then its absence from the first sample proves nothing: its content may be older.
 TEST_F(LinuxReportingChannelsTest, ThatTheFirstSampleCouldNotSeeHaveNoDifference)
 {
     fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,

@@ -1,4 +1,4 @@
-// What the kernel tells about sound cards, read from trees recorded on cards of several kinds.
+// The kernel's statistics of sound cards, from trees that were recorded on cards of several kinds.
 #include "platform/linux/channels/SoundCards.h"
 #include "support/TemporaryDirectory.h"
 
@@ -25,7 +25,7 @@ std::vector<std::string> namesOf(const std::vector<ReportingChannel>& channels)
 
 class SoundCardsTest : public testing::Test {
 protected:
-    // Takes what was recorded of such a card as what is there.
+    // Uses the recorded tree of such a card.
     void plug(const char* card)
     {
         fs::copy(fs::path(KESTO_RECORDED_SOUND) / card, root,
@@ -35,7 +35,7 @@ protected:
     {
         return SoundCards(root).read(selection);
     }
-    // The channel of that place, which must be there.
+    // The channel of that place, which must exist.
     [[nodiscard]] ReportingChannel channel(const std::string& place) const
     {
         const auto channels = read();
@@ -109,7 +109,7 @@ TEST_F(SoundCardsTest, OfASystemOnAChipMayBeInAnyState)
     EXPECT_EQ(names.back(), "SnapCard/Tx/pcm10p/sub0 format") << "after those with one digit";
 }
 
-TEST_F(SoundCardsTest, ThatNobodyUsesHaveTheirPointersAtRest)
+TEST_F(SoundCardsTest, ThatAreNotInUseHaveTheirPointersAtRest)
 {
     plug("none-running");
     const auto channels = read();

@@ -1,4 +1,4 @@
-// A folder that fills up: what goes, what stays whoever put it there, and how seldom anybody looks.
+// A folder that fills up: which files are removed, which stay, and how rarely the keeper reads it.
 #include "platform/linux/diagnostics/FolderKeeper.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"
@@ -38,7 +38,7 @@ protected:
         support::writeFile(folder / name, std::string(size, 'x'));
         fs::last_write_time(folder / name, epoch + std::chrono::hours(number));
     }
-    // The same, told to the keeper.
+    // The same, reported to the keeper.
     void add(int number, std::size_t size = 1)
     {
         make("note-" + std::to_string(number), number, size);
@@ -120,7 +120,7 @@ TEST_F(FolderKeeper, LetsTheOldestGoWhenTheyAreTooLargeTogether)
     EXPECT_THAT(names(), ElementsAre("note-2", "note-3", "note-4"));
 }
 
-TEST_F(FolderKeeper, LeavesTheNewestWhateverItsSize)
+TEST_F(FolderKeeper, AlwaysLeavesTheNewest)
 {
     add(1);
     queues.runAll();
@@ -228,10 +228,10 @@ TEST_F(FolderKeeper, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingElse)
     EXPECT_THAT(names(),
                 ElementsAre(".kestod-00000000000000aa.tmp", ".kestod-00000000000000bb.tmp",
                             ".kestod-0123456789abcdef.tmp.old", "note-1"));
-    EXPECT_THAT(log.lines(),
-                ElementsAre(IsLine(Default, "kerl",
-                                   "removed 2 files from " + folder.string()
-                                       + " that a service which was killed had begun to write")));
+    EXPECT_THAT(
+        log.lines(),
+        ElementsAre(IsLine(Default, "kerl",
+                           "removed 2 files from " + folder.string() + " that a killed service had not finished")));
 }
 
 TEST_F(FolderKeeper, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissing)
@@ -253,10 +253,9 @@ TEST_F(FolderKeeper, DoesNotLookThroughALink)
     add(9);
     queues.runAll();
     EXPECT_THAT(names(), SizeIs(9));
-    EXPECT_THAT(
-        log.lines(),
-        ElementsAre(IsLine(Error, "kerl",
-                           folder.string() + " cannot be looked through (Not a directory): its oldest files stay")));
+    EXPECT_THAT(log.lines(),
+                ElementsAre(IsLine(Error, "kerl",
+                                   folder.string() + " cannot be searched (Not a directory): its oldest files stay")));
     add(10);
     EXPECT_EQ(queues.pending(), 0U) << "not with each file that comes";
 }

@@ -1,4 +1,4 @@
-// Folders and files on the real file system: permissions, links that others put there, and disks that are full.
+// Folders and files on the real file system: permissions, links of other users, and full disks.
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"
 
@@ -23,7 +23,7 @@ using testing::UnorderedElementsAre;
 
 class FileSystem : public testing::Test {
 protected:
-    // What stands in a folder, hidden files too.
+    // The names in a folder, hidden files too.
     static std::vector<std::string> namesIn(const fs::path& path)
     {
         std::vector<std::string> names;
@@ -69,7 +69,7 @@ protected:
 
 // --- folders
 
-TEST_F(FileSystem, MakesEveryMissingFolderWithExactlyThePermissionsWhateverTheUmask)
+TEST_F(FileSystem, MakesEveryMissingFolderWithExactlyThePermissionsDespiteTheUmask)
 {
     for (const mode_t mask : {0U, 022U, 077U, 0777U}) {
         const mode_t before = ::umask(mask);
@@ -180,7 +180,7 @@ TEST_F(FileSystem, SaysWhyItsRootCannotBeMadeAgain)
 
 // --- files
 
-TEST_F(FileSystem, LetsEverybodyReadItsFilesWhateverTheUmask)
+TEST_F(FileSystem, LetsEverybodyReadItsFilesDespiteTheUmask)
 {
     for (const mode_t mask : {0U, 022U, 077U, 0777U}) {
         const fs::path path = root / std::to_string(mask);
@@ -270,8 +270,8 @@ TEST_F(FileSystem, SaysThatAFileMayNotBeRead)
         [&] { return becomeNobody() && files.readFile(root / "secret", 10).error() == std::errc::permission_denied; }));
 }
 
-// Of a device the opening alone may do something. The kernel tells who opens what.
-TEST_F(FileSystem, DoesNotOpenWhatIsNoFile)
+// Merely opening a device may have an effect. The kernel (inotify) reports each opening.
+TEST_F(FileSystem, DoesNotOpenWhatIsNotAFile)
 {
     ASSERT_EQ(::mkfifo((root / "pipe").c_str(), 0600), 0);
     const platform::FileDescriptor watch(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));

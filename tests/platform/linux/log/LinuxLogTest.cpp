@@ -47,7 +47,7 @@ protected:
         writer = FileDescriptor(ends[1]);
     }
 
-    // What the next write(2) wrote, or nothing when there was none.
+    // The bytes of the next write(2), or nothing without one.
     std::optional<std::string> nextWrite()
     {
         std::string bytes(1 << 20, '\0');
@@ -143,7 +143,7 @@ TEST_F(LinuxLogDescriptorTest, ManyThreadsDoNotMixTheirLines)
     }
 }
 
-TEST(LinuxLogTest, ADescriptorThatIsClosedIsNoFailure)
+TEST(LinuxLogTest, AClosedDescriptorIsNotAFailure)
 {
     LinuxLog(LogThresholds(), {.journalSocket = {}, .descriptor = -1}).write(record("into the void"));
 }
@@ -253,7 +253,7 @@ TEST_F(LinuxLogJournalTest, AJournalThatIsBehindLosesLinesAndIsToldHowMany)
 {
     listen();
     LinuxLog log(LogThresholds(), {.journalSocket = path, .descriptor = fallback.get()});
-    // Nobody reads: the queue of datagrams, or the room for them, fills up.
+    // Without a reader the queue of datagrams, or the room for them, fills up.
     constexpr int written = 3000;
     const std::string message(1000, 'x');
     for (int line = 0; line < written; ++line)

@@ -1,4 +1,4 @@
-// The list of levels in all its forms, and what is said about one that is none.
+// The list of levels in all its forms, and the errors of wrong lists.
 #include "platform/linux/log/LogThresholds.h"
 
 #include <gmock/gmock.h>

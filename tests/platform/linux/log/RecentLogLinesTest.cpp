@@ -1,4 +1,4 @@
-// What is left of the log when somebody wants to know what happened.
+// The kept lines of the log.
 #include "platform/linux/log/RecentLogLines.h"
 
 #include "foundation/text/LocalTime.h"

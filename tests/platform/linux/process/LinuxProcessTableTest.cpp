@@ -1,4 +1,4 @@
-// Names of processes, of real ones that bear whatever names a test gives them.
+// Names of real processes, which the tests choose.
 #include "platform/linux/process/LinuxProcessTable.h"
 
 #include "foundation/values/String.h"
@@ -46,7 +46,7 @@ TEST_F(LinuxProcessTableTest, KnowsItsOwnProcess)
 
 TEST_F(LinuxProcessTableTest, AProcessThatWasMissingIsLookedForAgain)
 {
-    // Nothing is remembered of what was not there.
+    // A missing process is not cached.
     NamedProcess process("player");
     const int identifier = process.identifier();
     EXPECT_EQ(LinuxProcessTable(&currentTime).entry(identifier)->commandName, "player");

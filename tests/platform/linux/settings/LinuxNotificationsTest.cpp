@@ -1,4 +1,4 @@
-// System notifications as files: what posts a name and what does not, and what is read as its state.
+// System notifications as files: which changes post a name, and the states.
 #include "platform/linux/settings/LinuxNotifications.h"
 
 #include "platform/linux/queues/LinuxWorkQueues.h"
@@ -62,8 +62,7 @@ protected:
         return notifications_.registerNotification(name, queue_, posts.handler());
     }
 
-    // Returns once everything that was posted before has been handled: the watcher tells in order, and the queue
-    // runs in order.
+    // Returns after all earlier posts were handled: the watcher reports in order, and the queue runs in order.
     void settle()
     {
         Posts fence;
@@ -133,7 +132,7 @@ TEST_F(LinuxNotificationsTest, PostsNothingWhenOtherDirectoriesComeAndGo)
     settle();
     fs::remove_all(temporary_.path() / "configuration");
     settle();
-    settle(); // what concerns directories is told after what else came with it
+    settle(); // changes of directories are reported after other changes that came with them
     EXPECT_TRUE(posts.tokens().empty());
 }
 
@@ -204,7 +203,7 @@ TEST_F(LinuxNotificationsTest, RefusesNamesThatCouldLeaveTheDirectory)
     EXPECT_EQ(notifications_.state(99).error(), LinuxNotifications::unknownToken);
 }
 
-TEST_F(LinuxNotificationsTest, PostsByHandForChangesThatAreNoFilesOfItsOwn)
+TEST_F(LinuxNotificationsTest, PostsByHandForChangesOutsideItsOwnFiles)
 {
     Posts posts;
     const auto registration = registerName("com.quarn.kesto.reporting", posts);
@@ -225,7 +224,7 @@ TEST_F(LinuxNotificationsTest, PostsByHandWithoutADirectoryToo)
     EXPECT_TRUE(posts.waitForMoreThan(0));
 }
 
-TEST_F(LinuxNotificationsTest, LetsNobodyElseWriteWhateverTheUmask)
+TEST_F(LinuxNotificationsTest, DoesNotLetOthersWriteDespiteTheUmask)
 {
     const mode_t umask = ::umask(0);
     const LinuxNotifications open(temporary_.path() / "open", watcher_, ProviderLog(log_));
@@ -234,7 +233,7 @@ TEST_F(LinuxNotificationsTest, LetsNobodyElseWriteWhateverTheUmask)
     EXPECT_EQ(fs::status(temporary_.path() / "open").permissions() & others, fs::perms::none);
 }
 
-TEST_F(LinuxNotificationsTest, SaysWhyThereIsNoDirectory)
+TEST_F(LinuxNotificationsTest, SaysWhyTheDirectoryIsMissing)
 {
     support::writeFile(temporary_.path() / "file", "");
     const LinuxNotifications broken(temporary_.path() / "file", watcher_, ProviderLog(log_));

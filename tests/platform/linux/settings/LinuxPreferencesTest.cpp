@@ -29,7 +29,7 @@ using testing::SizeIs;
 
 namespace fs = std::filesystem;
 
-// Gathers the domains of which a change was told, and waits for them.
+// Collects the domains with reported changes, and waits for them.
 class Changes {
 public:
     void add(std::string_view domain)
@@ -77,7 +77,7 @@ protected:
         watcher.reset();
     }
 
-    // Changes are told in order, so once this one is told, nothing earlier is still to come.
+    // Changes are reported in order, so after this report no earlier change can come.
     void expectNothingWasTold()
     {
         static int number = 0;
@@ -220,7 +220,7 @@ TEST_F(LinuxPreferencesTest, TellsOnlyOfDomainsWhoseValuesAreOthers)
     EXPECT_TRUE(changes.none());
 }
 
-TEST_F(LinuxPreferencesTest, TellsOfADomainThatNobodyHasReadYet)
+TEST_F(LinuxPreferencesTest, ReportsADomainThatWasNotReadYet)
 {
     fs::create_directories(folder);
     makePreferencesThatTell();
@@ -302,7 +302,7 @@ TEST_F(LinuxPreferencesTest, TellsNothingOfDomainsBeyondThoseKept)
 
 // --- The watcher
 
-TEST_F(LinuxPreferencesTest, NoThreadIsStartedBeforeSomebodyWatches)
+TEST_F(LinuxPreferencesTest, NoThreadIsStartedBeforeTheFirstWatch)
 {
     const std::size_t before = support::threadsOfTheProcess();
     ConfigurationWatcher unused(root, ProviderLog(log));
@@ -358,7 +358,7 @@ TEST_F(LinuxPreferencesTest, SaysWhichDirectoryItCannotWatch)
 
 class LinuxSettingsTest : public testing::Test {
 protected:
-    // Until it holds: changes are noticed by another thread.
+    // Waits until the condition holds, because another thread notices changes.
     template <typename Condition> [[nodiscard]] static bool becomesTrue(Condition condition)
     {
         const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);
@@ -375,7 +375,7 @@ protected:
     ConfigurationWatcher watcher{directory.path(), ProviderLog(log)};
 };
 
-TEST_F(LinuxSettingsTest, AFlagThatNobodySetIsOff)
+TEST_F(LinuxSettingsTest, AFlagThatIsNotSetIsOff)
 {
     const LinuxFeatureFlags flags(watcher, ProviderLog(log));
     EXPECT_FALSE(flags.isEnabled("Sonalis", "Tracing"));

@@ -146,11 +146,11 @@ TEST_F(TomlFileTest, ABrokenFileKeepsTheLastGoodValuesUntilItIsRepaired)
     EXPECT_FALSE(file.reload());
     EXPECT_EQ(file.values(), (Dictionary{{"a", 1}}));
     EXPECT_THAT(takeLines(),
-                ElementsAre(AllOf(Field(&support::LogLine::level, LogLevel::Error),
-                                  Field(&support::LogLine::message,
-                                        AllOf(testing::StartsWith(path.string() + ":2:5: "),
-                                              HasSubstr("what the file said before stays in force until this is "
-                                                        "corrected"))))));
+                ElementsAre(AllOf(
+                    Field(&support::LogLine::level, LogLevel::Error),
+                    Field(&support::LogLine::message,
+                          AllOf(testing::StartsWith(path.string() + ":2:5: "),
+                                HasSubstr("the file's earlier content stays in force until this is corrected"))))));
     support::writeFile(path, "a = 2\nb = 3\n");
     EXPECT_TRUE(file.reload());
     EXPECT_EQ(file.values(), (Dictionary{{"a", 2}, {"b", 3}}));
@@ -172,11 +172,10 @@ TEST_F(TomlFileTest, AFileThatIsTooLargeIsNotRead)
     support::writeFile(path, "a = 2\n#" + std::string(TomlFile::largest, 'x'));
     EXPECT_FALSE(file.reload());
     EXPECT_EQ(file.values(), (Dictionary{{"a", 1}}));
-    EXPECT_THAT(takeLines(),
-                ElementsAre(Field(&support::LogLine::message,
-                                  path.string()
-                                      + " cannot be read: File too large; what it said before stays in "
-                                        "force")));
+    EXPECT_THAT(
+        takeLines(),
+        ElementsAre(Field(&support::LogLine::message,
+                          path.string() + " cannot be read: File too large; its earlier content stays in force")));
 }
 
 TEST_F(TomlFileTest, AFileOfTheLargestSizeIsRead)

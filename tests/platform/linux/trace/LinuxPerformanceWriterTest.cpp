@@ -1,4 +1,4 @@
-// Performance data: what a file holds, when it takes its place, and what is said when it cannot.
+// Performance data: the content of a file, the time at which it gets its name, and the log lines of failures.
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"
@@ -87,7 +87,7 @@ TEST_F(PerformanceWriter, WritesNamesAsJsonText)
 )");
 }
 
-TEST_F(PerformanceWriter, WritesNullForWhatIsNoNumberInJson)
+TEST_F(PerformanceWriter, WritesNullForNumbersThatJsonCannotExpress)
 {
     auto file = open();
     file->write("a", std::numeric_limits<double>::quiet_NaN(), PerformanceUnit::Nanoseconds);

@@ -1,5 +1,5 @@
-// The kernel's own tracefs for a test, where this machine lets it have one: mounted in a name space of the process's
-// own, so that it is gone with it.
+// The kernel's own tracefs for a test, where this machine allows it: mounted in a name space of the process, with which
+// it goes.
 #pragma once
 
 #include "support/TemporaryDirectory.h"
@@ -25,7 +25,7 @@ public:
         else
             writeFile(mounts_.path() / "mounts", "none " + directory_.path().native() + " tracefs rw 0 0\n");
     }
-    // Instances that nobody holds open any more go; the kernel keeps the others.
+    // Removes instances that no process holds open; the kernel keeps the others.
     ~RealTracefs()
     {
         if (problem_)
@@ -37,7 +37,7 @@ public:
     RealTracefs(const RealTracefs&) = delete;
     RealTracefs& operator=(const RealTracefs&) = delete;
 
-    // Why there is none.
+    // The reason if it is not available.
     [[nodiscard]] const std::optional<std::string>& problem() const { return problem_; }
     [[nodiscard]] const std::filesystem::path& path() const { return directory_.path(); }
     [[nodiscard]] std::filesystem::path mounts() const { return mounts_.path() / "mounts"; }

@@ -1,4 +1,4 @@
-// Which session gets which events of the one trace, and when it is told that it has them all.
+// Which session gets which events of the one trace, and when it is completed.
 #include "platform/linux/trace/TraceFanOut.h"
 #include "support/fakes/FakeLog.h"
 
@@ -13,7 +13,7 @@ using support::IsLine;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// Runs its items when it is told to.
+// Runs its items when the test calls `run`.
 class HeldQueue final : public WorkQueue {
 public:
     void submit(WorkItem item) override { items_.push_back(std::move(item)); }
@@ -42,7 +42,7 @@ struct Listener {
         subscription->queue = queue;
         subscription->startTime = start;
     }
-    ~Listener() { queue->run(); } // what it holds holds the queue
+    ~Listener() { queue->run(); } // its items hold the queue
     Listener(const Listener&) = delete;
     Listener& operator=(const Listener&) = delete;
     void end(std::uint64_t time) const { subscription->endTime = time; }
@@ -208,7 +208,7 @@ TEST_F(TraceFanOutTest, MayLoseASessionToItsOwnCompletion)
     bool isCompleted = false;
     subscription->completion = [&, keep = std::make_shared<int>(1)] {
         subscription.reset();
-        isCompleted = *keep == 1; // what the handler holds is there for as long as it runs
+        isCompleted = *keep == 1; // the handler's captures exist as long as it runs
     };
     subscription->endTime = 5;
     ASSERT_TRUE(fanOut.add(subscription));
@@ -262,7 +262,7 @@ TEST_F(TraceFanOutTest, TakesSoManySessions)
     EXPECT_FALSE(fanOut.add(std::make_shared<TraceSubscription>()));
 }
 
-// Against asking of every event whether every session wants it.
+// Compared with a check of every event against every session.
 TEST_F(TraceFanOutTest, GivesAnySessionsWhatIsTheirs)
 {
     rc::check([this](std::vector<std::uint8_t> times, const std::vector<std::tuple<std::uint8_t, std::uint8_t>>& spans,

@@ -1,4 +1,4 @@
-// What clients are handed to emit trace events: when, to whom, and what they cannot do with it.
+// The descriptors with which clients emit trace events: when clients get them, which clients do, and their limits.
 #include "platform/linux/trace/TraceMarkerAccess.h"
 #include "platform/linux/connection/ConnectionHarness.h"
 #include "platform/linux/trace/TraceMarker.h"
@@ -21,7 +21,7 @@ using support::framed;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// The marker's stand-in: what is written to one end comes out at the other.
+// Stands in for the marker: bytes that are written to one end come out at the other.
 class Pipe {
 public:
     Pipe()
@@ -79,7 +79,7 @@ TEST_F(TraceMarkerAccessTest, ForgetsWhoDoesNotWaitAnyMore)
     EXPECT_FALSE(isAnswered);
 }
 
-TEST_F(TraceMarkerAccessTest, ShowsOnThePageWhetherSomebodyTraces)
+TEST_F(TraceMarkerAccessTest, ShowsOnThePageWhetherATraceRuns)
 {
     const TraceDescriptors descriptors = opened();
     EXPECT_EQ(flagIn(descriptors.page), 0U);
@@ -89,7 +89,7 @@ TEST_F(TraceMarkerAccessTest, ShowsOnThePageWhetherSomebodyTraces)
     EXPECT_EQ(flagIn(descriptors.page), 0U);
 }
 
-TEST_F(TraceMarkerAccessTest, LetsNobodyElseChangeThePage)
+TEST_F(TraceMarkerAccessTest, DoesNotLetOthersChangeThePage)
 {
     const int page = opened().page;
     EXPECT_EQ(::mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED, page, 0), MAP_FAILED);
@@ -114,7 +114,7 @@ TEST_F(TraceMarkerAccessTest, LetsNobodyElseChangeThePage)
 
 class TraceMarkerConnections : public support::ConnectionTest {
 protected:
-    // The numbers of the answers up to that of the request, and what came with them.
+    // The numbers of the answers up to that of the request, and the descriptors that came with them.
     struct Received {
         std::vector<int> numbers;
         std::vector<FileDescriptor> descriptors;
@@ -187,7 +187,7 @@ TEST_F(TraceMarkerConnections, HandOverTheMarkerAndThePage)
     EXPECT_EQ(flagIn(received.descriptors[1].get()), 1U);
 }
 
-TEST_F(TraceMarkerConnections, AreAnsweredWhenSomebodyTracesForTheFirstTime)
+TEST_F(TraceMarkerConnections, AreAnsweredWhenTheFirstTraceStarts)
 {
     listen();
     Client client(path);

@@ -119,7 +119,7 @@ TEST_F(TraceMergerTest, HoldsNoMoreThanItMay)
     EXPECT_THAT(codesUpTo(2), ElementsAre(7)) << "there is room again";
 }
 
-// Against sorting everything that was ever there.
+// Compared with sorting all events together.
 TEST_F(TraceMergerTest, OrdersAnyEventsAsSortingWould)
 {
     rc::check([](const std::vector<std::tuple<std::uint8_t, std::uint8_t, bool>>& steps) {

@@ -1,5 +1,5 @@
-// Pages of the kernel's trace, taken apart: recorded ones, ones made by hand with everything that may stand in one, and
-// ones that no kernel would make.
+// Reading pages of the kernel's trace: recorded ones, ones made by hand with everything that a page may hold, and
+// malformed ones.
 #include "platform/linux/trace/TracePage.h"
 #include "platform/linux/trace/TracePages.h"
 
@@ -21,7 +21,7 @@ struct Reading {
     bool isBroken = false;
 };
 
-// Of a copy that ends where the page ends, so that reading behind it is noticed.
+// Reads a copy that ends with the page, so that reading beyond it is noticed.
 Reading read(const std::string& page, const TracePageFormat& format = {})
 {
     const std::vector<char> copy(page.begin(), page.end());
@@ -123,7 +123,7 @@ TEST(TracePages, OfA32BitKernelHaveAShorterHead)
     EXPECT_THAT(reading.records, ElementsAre(Pair(1007U, "four")));
 }
 
-// ---- What no kernel makes
+// ---- Malformed ones
 
 TEST(TracePages, AreBrokenWhenTheyAreShorterThanTheirHead)
 {
@@ -169,7 +169,7 @@ TEST(TracePages, OfAnyBytesAreReadToAnEnd)
     });
 }
 
-TEST(TracePages, HoldWhateverRecordsWerePutIn)
+TEST(TracePages, HoldAllRecordsThatWerePutIn)
 {
     rc::check([](const std::vector<std::pair<std::uint32_t, std::uint8_t>>& steps, std::uint32_t start) {
         TracePageBuilder builder(start);

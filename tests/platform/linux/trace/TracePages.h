@@ -1,4 +1,4 @@
-// Pages of the kernel's trace made by hand, and trees of files that look like tracefs.
+// Pages of the kernel's trace made by hand, and imitations of tracefs.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -46,7 +46,7 @@ public:
         data_.append(bytes).append(words * 4 - bytes.size(), '\0');
         return *this;
     }
-    // An event of our own.
+    // An event of the service's own.
     TracePageBuilder& event(std::uint64_t time, std::uint32_t code, std::uint32_t thread = 1,
                             std::array<std::uint64_t, 4> arguments = {})
     {
@@ -146,7 +146,7 @@ inline std::span<const std::byte> asBytes(std::string_view text)
     return std::as_bytes(std::span(text));
 }
 
-// A directory with the files of an instance that the service uses. Pages are pipes: what is put in comes out once.
+// A directory with the files of an instance that the service uses. Pages are pipes: each page is read once.
 class TracefsTree {
 public:
     explicit TracefsTree(int processors = 2, const std::string& name = "kesto")

@@ -1,5 +1,4 @@
-// The files of tracefs, on a directory that looks like it: how an instance is found, set up, taken over and read, and
-// what is said where that cannot be.
+// An instance on an imitation of tracefs: how it is found, set up, taken over and read, and the errors of each step.
 #include "platform/linux/trace/TracefsInstance.h"
 #include "platform/linux/trace/TracePages.h"
 
@@ -64,7 +63,7 @@ TEST_F(TracefsInstanceTest, IsTakenOverSwitchedOffAndEmpty)
     EXPECT_EQ(tree.content("tracing_on"), "0");
     EXPECT_EQ(tree.content("trace_clock"), "mono");
     EXPECT_EQ(tree.content("trace"), "");
-    EXPECT_EQ(tree.content("buffer_size_kb"), "before") << "a buffer costs nothing before somebody traces";
+    EXPECT_EQ(tree.content("buffer_size_kb"), "before") << "a buffer takes no memory before the first trace";
     EXPECT_EQ(instance->markerType(), 19U);
     EXPECT_EQ(instance->pageFormat().dataOffset, 16U);
     EXPECT_EQ(instance->pageFormat().commitSize, 8U);
@@ -117,7 +116,7 @@ TEST_F(TracefsInstanceTest, BelongsToOneServiceAtATime)
     const auto second = open();
     ASSERT_FALSE(second);
     EXPECT_TRUE(second.error().isInUse);
-    EXPECT_THAT(second.error().what, EndsWith("instances/kesto belongs to another service that runs"));
+    EXPECT_THAT(second.error().what, EndsWith("instances/kestois in use by another running service"));
     {
         const TracefsInstance gone = *std::move(instance);
     }
@@ -153,7 +152,7 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenTheKernelsFormatsAreOthers)
     for (const char* file : {"events/header_page", "events/ftrace/raw_data/format"}) {
         const fs::path path = tree.instance / file;
         const std::string right = readFile(path);
-        const std::string expected = std::string(file) + " is not as this service knows it";
+        const std::string expected = std::string(file) + " has another form than this service expects";
         for (const std::string_view number :
              {"offset:8;", "size:8;", "offset:16;", "offset:12;", "offset:4;", "ID: 19"}) {
             const std::size_t place = right.rfind(number);
@@ -163,7 +162,7 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenTheKernelsFormatsAreOthers)
             wrong.replace(place, number.size(),
                           number.starts_with("ID") ? "ID: 65536" : "offset:99999999999999999999;");
             writeFile(path, wrong);
-            if (number == "size:8;") // that of the timestamp, or of the least of them, is not looked at
+            if (number == "size:8;") // the size of the timestamp is not checked
                 continue;
             EXPECT_THAT(problem(), EndsWith(expected)) << number;
         }

@@ -1,5 +1,5 @@
-// The kernel event trace service: on a directory that looks like tracefs, for all that may go wrong with it; and on the
-// kernel itself, with real processes that emit, where this machine lets it.
+// The kernel event trace service: on an imitation of tracefs, for failures; and on the kernel itself, with real
+// emitting processes, where this machine allows it.
 #include "platform/linux/trace/TracefsKernelTrace.h"
 #include "platform/linux/queues/SerialQueue.h"
 #include "platform/linux/trace/DeliveredEvents.h"
@@ -49,15 +49,15 @@ std::int64_t timeOfDay(const KernelTraceEvent& event)
 {
     return event.wallTime.seconds * 1'000'000 + event.wallTime.microseconds;
 }
-constexpr std::int64_t clockTolerance = 500'000; // the two clocks are not looked at in one moment
+constexpr std::int64_t clockTolerance = 500'000; // the two clocks are not read at the same moment
 
-// A session and what was delivered to it.
+// A session and its delivered events.
 class Listener {
 public:
     explicit Listener(TracefsKernelTrace& trace, bool hasWallTimes = true) : session(trace.createTraceSession())
     {
         if (!session)
-            throw std::runtime_error("there is no trace");
+            throw std::runtime_error("the trace is not available");
         session->enableWallTimes(hasWallTimes);
         delivered_.listenTo(*session, *queue);
         EXPECT_EQ(delivered_.filter(*session, *queue, firstCode, lastCode), 0);
@@ -98,7 +98,7 @@ public: // these go first
 class TracefsKernelTraceTest : public testing::Test {
 protected:
     [[nodiscard]] std::string markers() const { return tree.content("trace_marker_raw"); }
-    // Until the thread has switched the instance off.
+    // Waits until the thread has switched the instance off.
     [[nodiscard]] bool waitUntilOff() const
     {
         const auto end = std::chrono::steady_clock::now() + patience;
@@ -192,7 +192,7 @@ TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
     EXPECT_EQ(next.session->lostEvents(), 0U) << "what others lost before";
 }
 
-TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherSomebodyTraces)
+TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherATraceRuns)
 {
     std::optional<TraceDescriptors> handedOut;
     access.ask(this, [&](const TraceDescriptors& descriptors) { handedOut = descriptors; });
@@ -251,8 +251,9 @@ TEST_F(TracefsKernelTraceTest, CountsAsOffWithoutTracefsAndSaysSoOnce)
     EXPECT_FALSE(trace.isAvailable());
     EXPECT_EQ(trace.createTraceSession(), nullptr);
     EXPECT_EQ(trace.createTraceSession(), nullptr);
-    EXPECT_THAT(log.take(),
-                ElementsAre(IsLine(LogLevel::Error, "kerl", "there is no kernel trace: tracefs is not mounted")));
+    EXPECT_THAT(
+        log.take(),
+        ElementsAre(IsLine(LogLevel::Error, "kerl", "the kernel trace is not available: tracefs is not mounted")));
     support::writeFile(tree.mounts, mounted);
     fs::rename(tree.instance / "tracing_on", tree.instance / "kept");
     EXPECT_EQ(trace.createTraceSession(), nullptr);
@@ -314,7 +315,7 @@ TEST_F(TracefsKernelTraceTest, SaysWhatIsForbidden)
     for (const fs::path& path : {tree.directory.path(), tree.directory.path() / "tracing", tree.mounts})
         fs::permissions(path, fs::perms(0055), fs::perm_options::add);
     fs::permissions(tree.instance.parent_path(), fs::perms::none);
-    ASSERT_TRUE(!isRoot || ::seteuid(nobody) == 0); // nothing is forbidden to root
+    ASSERT_TRUE(!isRoot || ::seteuid(nobody) == 0); // root may do everything
     const auto session = trace.createTraceSession();
     ASSERT_TRUE(!isRoot || ::seteuid(0) == 0);
     fs::permissions(tree.instance.parent_path(), fs::perms::owner_all);
@@ -324,10 +325,10 @@ TEST_F(TracefsKernelTraceTest, SaysWhatIsForbidden)
 
 // ---- On the kernel
 
-// One process that emits, and when it did: before and after each event.
+// A process that emits, with the times before and after each event.
 struct Emitter {
     static constexpr std::size_t most = 100'000;
-    static constexpr std::size_t lead = 200; // how far it may run ahead of who reads, which may be much slower
+    static constexpr std::size_t lead = 200; // how far it may run ahead of the reader, which may be much slower
     struct Moment {
         std::uint64_t before;
         std::uint64_t after;
@@ -362,7 +363,7 @@ TEST_F(RealTraceTest, DeliversTheEventsOfThisProcessWithTheirTimes)
 {
     Listener listener(*trace);
     const TraceMarkerRecord early{.code = firstCode};
-    EXPECT_LT(::write(marker, &early, sizeof early), 0) << "the kernel takes nothing while nobody traces";
+    EXPECT_LT(::write(marker, &early, sizeof early), 0) << "the kernel takes no events while no trace runs";
     ASSERT_EQ(listener.start(), 0);
     const std::int64_t day = timeOfDay();
     const std::uint64_t before = now();
@@ -385,7 +386,7 @@ TEST_F(RealTraceTest, DeliversTheEventsOfThisProcessWithTheirTimes)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-// A test of everything at once: sessions come and go while processes emit, and each gets exactly what is its own.
+// All together: sessions come and go while processes emit, and each session gets exactly its own events.
 TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
 {
     constexpr std::size_t processes = 3;
@@ -469,7 +470,7 @@ TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
             const auto begin = emitter.moments.begin();
             const auto end = begin + static_cast<std::ptrdiff_t>(count);
             const auto& numbers = delivered[index];
-            // What was surely within, and what may have been.
+            // The events that were certainly within the session, and those that may have been.
             const auto sure = std::ranges::lower_bound(begin, end, listener.afterStart, {}, &Emitter::Moment::before);
             const auto sureEnd = std::ranges::upper_bound(sure, end, listener.beforeEnd, {}, &Emitter::Moment::after);
             for (std::size_t place = 1; place < numbers.size(); ++place)

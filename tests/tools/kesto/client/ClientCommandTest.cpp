@@ -39,12 +39,12 @@ class ClientCommand : public testing::Test {
 protected:
     void SetUp() override { kestod.startAndAwait(); }
 
-    // With --wait, since what does not come would be waited for.
+    // With --wait, to bound the time for a missing answer.
     [[nodiscard]] Finished run(const std::string& input) const
     {
         return tool.run({"client", "--wait", "20", "--socket", kestod.socketPath()}, input);
     }
-    // The answers when all goes well.
+    // The answers of a successful run.
     [[nodiscard]] std::vector<std::string> answers(const std::string& input) const
     {
         const Finished finished = run(input);
@@ -169,7 +169,7 @@ TEST_F(ListeningClientCommand, ReadsAMillionBytesInALineAndALastLineWithoutItsEn
                 ElementsAre(Field(&end_to_end::StoredEvent::payload, StartsWith("{\"large\":\"" + large))));
 }
 
-// --- what can be wrong with a line
+// --- wrong lines
 
 struct WrongLine {
     std::string name;
@@ -225,7 +225,7 @@ INSTANTIATE_TEST_SUITE_P(
         WrongLine{"ALineThatNeverEnds", std::string(9 * 1024 * 1024, ' ') + "[\"kill\"]", "longer than 8388608 bytes"}),
     [](const auto& line) { return line.param.name; });
 
-// --- what can be wrong with the connection
+// --- failures of the connection
 
 TEST(ClientWithoutAService, SaysThatNobodyIsThere)
 {
@@ -249,7 +249,7 @@ TEST_F(ListeningClientCommand, SaysThatTheServiceIsGone)
     kestod.kill();
     client->closeInput();
     const auto status = client->wait();
-    // The loss may show before or after the end of the input.
+    // The tool may notice the loss before or after the end of the input.
     if (client->errors().empty())
         EXPECT_EQ(status, 0);
     else {

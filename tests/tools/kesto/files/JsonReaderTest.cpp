@@ -29,7 +29,7 @@ TEST(ParseJson, KeepsKindsAndOrder)
     EXPECT_EQ(parseJson("5"), Value(5));
 }
 
-TEST(ParseJson, RefusesWhatIsNoneOrMoreThanOne)
+TEST(ParseJson, RefusesAnythingButExactlyOne)
 {
     for (const char* text : {"", " ", "{", "[1,]", "1 2", "{\"a\" 1}", "nan", "\"\xFF\"", "'a'", "1e999"})
         EXPECT_EQ(parseJson(text), std::nullopt) << text;

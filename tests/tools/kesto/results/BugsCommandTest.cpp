@@ -1,4 +1,4 @@
-// Captured bugs from a shell: what the service's folder holds, as a table, as JSON, and one as a whole.
+// `kesto bugs`: the service's captures as a table, as JSON, and one with all details.
 #include "end_to_end/Kestod.h"
 #include "platform/linux/bugs/BugCaptureFolder.h"
 #include "support/ParseJson.h"
@@ -22,7 +22,7 @@ using testing::Not;
 
 class BugsCommand : public testing::Test {
 protected:
-    // As the service writes one, at 08:00:00 on 2027-01-15.
+    // A capture as the service writes it, at 08:00:00 on 2027-01-15.
     void capture(const std::string& process, const std::string& log = "a line\n", std::size_t mostWithBulk = 10)
     {
         BugCaptureFolder folder(state, BugCaptureFolder::Limits{.mostWithBulk = mostWithBulk});
@@ -49,7 +49,7 @@ protected:
     Tool tool{directory.path()};
 };
 
-TEST_F(BugsCommand, SaysThatThereAreNone)
+TEST_F(BugsCommand, SaysThatItFoundNone)
 {
     EXPECT_EQ(tool.print({"bugs"}), "No bugs were captured in " + captures.native() + ".\n");
     EXPECT_EQ(tool.print({"bugs", "--json"}), "");
@@ -72,7 +72,7 @@ TEST_F(BugsCommand, ShowsWhoseStateHadToGo)
     EXPECT_THAT(tool.print({"bugs"}), HasSubstr("     1 2027-01-15 08:00:00          - player"));
     EXPECT_THAT(tool.print({"bugs", "1"}),
                 AllOf(HasSubstr("detectedProcess: player\n"),
-                      HasSubstr("The state of the device is not kept any more: newer captures needed the room.\n")));
+                      HasSubstr("The state of the device was removed to make room for newer captures.\n")));
 }
 
 TEST_F(BugsCommand, CutsTheTableToTheWidth)
@@ -154,7 +154,7 @@ TEST_F(BugsCommand, FollowsNoLinksAndStumblesOverNothingThatIsBroken)
     EXPECT_EQ(std::ranges::count(tool.print({"bugs"}), '\n'), 2);
 }
 
-TEST_F(BugsCommand, ReadsTheDirectoryThatItIsTold)
+TEST_F(BugsCommand, ReadsTheDirectoryThatIsNamed)
 {
     capture("player");
     fs::rename(captures, directory.path() / "elsewhere");
@@ -181,7 +181,7 @@ TEST_F(BugsCommand, ShowsWhatARealServiceCaptured)
 TEST_F(BugsCommand, SaysWhatIsNotThere)
 {
     capture("player");
-    expectFailure({"bugs", "7"}, "there is no bug 7 in " + captures.native());
+    expectFailure({"bugs", "7"}, "bug 7 does not exist in " + captures.native());
     const std::string missing = directory.path() / "missing/bug-captures";
     expectFailure({"bugs", "--directory", missing}, "cannot read " + missing + ": No such file or directory");
     EXPECT_EQ(tool.run({"bugs", "seven"}).status, 2);

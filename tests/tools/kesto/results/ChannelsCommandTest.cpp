@@ -24,7 +24,7 @@ protected:
         std::filesystem::create_directories((root / place).parent_path());
         support::replaceFile(root / place, text);
     }
-    // No sound card of this machine comes in between.
+    // Keeps the machine's own sound cards out of the test.
     [[nodiscard]] Tool::Arguments arguments(const Tool::Arguments& more = {}) const
     {
         Tool::Arguments all{"channels", "--sound", "/nonexistent"};
@@ -53,7 +53,7 @@ TEST_F(ChannelsCommand, ListsWhatIsPublished)
               "amp<0x1a>        Speaker      -          latency                  0-10:5 30-40:2 ms, 3 to 37\n");
 }
 
-TEST_F(ChannelsCommand, SaysThatThereAreNone)
+TEST_F(ChannelsCommand, SaysThatItFoundNone)
 {
     EXPECT_EQ(tool.print(arguments()), "No channels are published in " + root.native() + ".\n");
     EXPECT_EQ(tool.print(arguments({"--json"})), "");
@@ -88,7 +88,7 @@ TEST_F(ChannelsCommand, ListsThoseOfAGroupOrASubgroup)
     EXPECT_THAT(tool.print(arguments({"--group", "../.."})), StartsWith("No channels"));
 }
 
-TEST_F(ChannelsCommand, FindsTheTreeWhereItIsTold)
+TEST_F(ChannelsCommand, FindsTheTreeThatIsNamed)
 {
     publish("amp/Tx/-/a", "simple\n1\n");
     const auto other = directory.path() / "other";
@@ -144,7 +144,7 @@ TEST_F(ChannelsCommand, WatchesWhatChanges)
     ASSERT_EQ(publisher.open(options), kesto::Status::Ok);
     ASSERT_EQ(channel.create(publisher, {"mixer", "Tx", "", "cycles"}), kesto::Status::Ok);
     const auto watching = tool.start(arguments({"--watch", "--interval", "0.05", "--json"}));
-    const std::jthread changing([&](const std::stop_token& end) { // the tool has its first look some time
+    const std::jthread changing([&](const std::stop_token& end) { // the time of the tool's first reading is not known
         while (!end.stop_requested()) {
             channel.add(7);
             publisher.flush();

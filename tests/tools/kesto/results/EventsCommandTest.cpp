@@ -1,4 +1,4 @@
-// Reading the event store: as a table, as JSON, filtered, followed, and when something is wrong with it.
+// Reading the event store: as a table, as JSON, filtered, followed, and with errors.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 #include "tools/kesto/Tool.h"
@@ -182,9 +182,9 @@ TEST_F(EventsCommand, ShowsTheMostRecentOnesInTheOrderInWhichTheyCame)
     EXPECT_EQ(printJson({"--count", "1", "--name", "[ab]"}), jsonLine(2, "b"));
 }
 
-// --- where it is
+// --- the store's place
 
-TEST_F(EventsCommand, FindsTheStoreWhereItIsTold)
+TEST_F(EventsCommand, FindsTheStoreThatIsNamed)
 {
     makeStore({"state"});
     const fs::path other = directory.path() / "a ?b#c%41.sqlite3";
@@ -204,9 +204,9 @@ TEST_F(EventsCommand, FindsTheStoreWhereItIsTold)
     EXPECT_EQ(printJson(), jsonLine(1, "xdg"));
 }
 
-TEST_F(EventsCommand, ReadsAStoreThatNobodyWritesAndLeavesNoTrace)
+TEST_F(EventsCommand, ReadsAStoreWithoutAWriterAndLeavesNoTrace)
 {
-    makeStore({"a"}); // closed, and with it its log
+    makeStore({"a"}); // closed, which removes its log
     ASSERT_FALSE(fs::exists(store.native() + "-wal"));
     fs::permissions(store.parent_path(), fs::perms(0555));
     tool.giveUpRights();
@@ -226,11 +226,11 @@ TEST_F(EventsCommand, ReadsAStoreThatIsBeingWritten)
     EXPECT_EQ(printJson(), jsonLine(1, "a") + jsonLine(2, "b"));
 }
 
-// --- what can be wrong
+// --- failures
 
-TEST_F(EventsCommand, SaysThatThereIsNoStore)
+TEST_F(EventsCommand, SaysThatTheStoreIsMissing)
 {
-    expectFailure("there is no event store at " + store.native() + ": has kestod run?");
+    expectFailure("the event store " + store.native() + " does not exist: has kestod run?");
 }
 
 TEST_F(EventsCommand, SaysThatItMayNotReadTheStore)
@@ -244,7 +244,7 @@ TEST_F(EventsCommand, SaysThatItMayNotReadTheStore)
     fs::permissions(store.parent_path(), fs::perms(0755));
 }
 
-TEST_F(EventsCommand, SaysThatAFileIsNoDatabase)
+TEST_F(EventsCommand, SaysThatAFileIsNotADatabase)
 {
     support::writeFile(store, std::string(10'000, 'x'));
     expectFailure("file is not a database");
@@ -328,7 +328,7 @@ TEST_F(EventsCommand, LosesNoCommitOfManyWhileFollowing)
     EXPECT_EQ(follower->waitForOutput("{\"id\":500,\"time\":1000,\"name\":\"event\",\"payload\":{}}\n"), expected);
 }
 
-TEST_F(EventsCommand, FollowsAStoreThatNobodyWroteBefore)
+TEST_F(EventsCommand, FollowsAStoreThatHadNoWriter)
 {
     makeStore({"a"});
     const auto follower = tool.start({"events", "--json", "--follow"});
@@ -347,7 +347,7 @@ TEST_F(EventsCommand, FollowsTheStoreThatTakesThePlaceOfTheOneItReads)
     for (const std::string file : {"", "-wal", "-shm"})
         if (fs::exists(store.native() + file))
             fs::rename(store.native() + file, store.native() + ".corrupt-1" + file);
-    database = makeStore({"c"}); // bit by bit: for a moment it is no store yet
+    database = makeStore({"c"}); // step by step: for a moment it is not a store yet
     EXPECT_THAT(follower->waitForOutput("\"c\""), EndsWith(jsonLine(1, "c")));
     database->add(1000, "d");
     EXPECT_THAT(follower->waitForOutput("\"d\""), EndsWith(jsonLine(1, "c") + jsonLine(2, "d")));
@@ -368,7 +368,7 @@ TEST_F(EventsCommand, FollowsARealService)
     EXPECT_THAT(follower->waitForOutput("a=2"), HasSubstr("kesto.Playback.Stop "));
 }
 
-TEST_F(EventsCommand, EndsWhenNobodyReadsWhatItFollows)
+TEST_F(EventsCommand, EndsWhenItsOutputHasNoReader)
 {
     const auto database = makeStore({"a"});
     const Finished finished = tool.runShell("$kesto events --follow >/dev/full");

@@ -29,7 +29,7 @@ protected:
         const std::string path = write(text);
         const Finished finished = tool.run({"summary", path});
         EXPECT_EQ(finished.status, 1) << text;
-        EXPECT_EQ(finished.errors, "kesto: " + path + " is no summary of a session: " + reason + "\n");
+        EXPECT_EQ(finished.errors, "kesto: " + path + " is not a summary of a session: " + reason + "\n");
     }
 
     const support::TemporaryDirectory directory;
@@ -135,7 +135,7 @@ TEST_F(SummaryCommand, ReadsFromAPipe)
     EXPECT_THAT(finished.output, HasSubstr(" a=1\n"));
 }
 
-TEST_F(SummaryCommand, SaysThatAFileIsNoSummary)
+TEST_F(SummaryCommand, SaysThatAFileIsNotASummary)
 {
     expectFailure("", "it is empty, as when a value could not be written as JSON");
     expectFailure("{}", "it is not a list");
@@ -143,7 +143,7 @@ TEST_F(SummaryCommand, SaysThatAFileIsNoSummary)
     expectFailure("hello", "not JSON: Invalid value. (at byte 1)");
     for (const char* text : {"[1]", "[[]]", "[{}]", R"([{"A_B_1": 1}])", R"([{"A_B_1": {}, "A_B_2": {}}])",
                              R"([{"name": {}}])", R"([{"A_B_x": {}}])", R"([{"A_1": {}}])", "[null]"})
-        expectFailure(text, "its element 1 is no message under its identifier");
+        expectFailure(text, "its element 1 is not a message under its identifier");
     expectFailure(std::string(1'000'000, '['), "it is nested too deep");
     expectFailure(std::string("[\0]", 3), "not JSON: Invalid value. (at byte 2)");
 }
@@ -157,7 +157,7 @@ TEST_F(SummaryCommand, ShowsASummaryUpToWhereItIsBroken)
     EXPECT_THAT(finished.output, Not(HasSubstr("message\n")));
     EXPECT_THAT(finished.errors, HasSubstr("not JSON"));
     write(R"([{"A_B_1": {}}, {"A_B_2": {}}, 3])");
-    EXPECT_THAT(tool.run({"summary", path}).errors, HasSubstr("its element 3 is no message"));
+    EXPECT_THAT(tool.run({"summary", path}).errors, HasSubstr("its element 3 is not a message"));
 }
 
 TEST_F(SummaryCommand, SaysThatItCannotReadAFile)

@@ -1,4 +1,4 @@
-// What a person is told of a session's messages.
+// The timeline of a session's messages.
 #include "kesto/results/Timeline.h"
 
 #include <gmock/gmock.h>

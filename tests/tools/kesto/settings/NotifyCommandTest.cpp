@@ -1,4 +1,4 @@
-// Posting notifications, up to the session that is told.
+// Posting notifications, up to the session that gets them.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 #include "tools/kesto/Tool.h"
@@ -51,7 +51,7 @@ TEST_F(NotifyCommand, KeepsTheStateWhenItIsGivenNone)
     EXPECT_EQ(support::readFile(file.parent_path() / "other"), "");
 }
 
-TEST_F(NotifyCommand, FindsTheDirectoryWhereItIsTold)
+TEST_F(NotifyCommand, FindsTheDirectoryThatIsNamed)
 {
     const auto other = directory.path() / "other";
     std::filesystem::create_directory(other);
@@ -64,12 +64,12 @@ TEST_F(NotifyCommand, FindsTheDirectoryWhereItIsTold)
     EXPECT_EQ(support::readFile(directory.path() / "kesto/notifications/name"), "2\n");
 }
 
-TEST_F(NotifyCommand, SaysWhenThereIsNoServiceToTell)
+TEST_F(NotifyCommand, SaysThatTheServiceIsMissing)
 {
     tool.setVariable("RUNTIME_DIRECTORY=/nonexistent/kesto");
     const Finished finished = tool.run({"notify", "name", "1"});
     EXPECT_EQ(finished.status, 1);
-    EXPECT_THAT(finished.errors, HasSubstr("no runtime directory at /nonexistent/kesto"));
+    EXPECT_THAT(finished.errors, HasSubstr("the runtime directory /nonexistent/kesto does not exist"));
 }
 
 TEST_F(NotifyCommand, SaysWhenItMayNot)

@@ -1,4 +1,4 @@
-// Preferences from a shell: what is written is what the service reads, up to the session that is told.
+// `kesto prefs`: the service reads the written values, up to the session that gets them.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 #include "platform/linux/settings/TomlFile.h"
@@ -27,7 +27,7 @@ protected:
         fs::create_directories(file.parent_path());
         support::writeFile(file, text);
     }
-    // What the service reads there now.
+    // The value that the service now reads.
     [[nodiscard]] foundation::Dictionary values() const
     {
         return platform::parseToml(support::readFile(file)).value_or(foundation::Dictionary());
@@ -85,7 +85,7 @@ TEST_F(PrefsCommand, SetsValuesOfTheKindThatTheyLookLike)
     EXPECT_EQ(kept.kind(), Value::Kind::Date);
 }
 
-TEST_F(PrefsCommand, SetsTextWhateverItLooksLikeWhenAsked)
+TEST_F(PrefsCommand, SetsAnyTextAsTextWhenAsked)
 {
     for (const std::string text : {"true", "5", "\"quoted\"", "[1", "99999999999999999999", "inf"}) {
         EXPECT_EQ(tool.print({"prefs", "set", "--string", domain, "key", text}), "");
@@ -95,12 +95,12 @@ TEST_F(PrefsCommand, SetsTextWhateverItLooksLikeWhenAsked)
     EXPECT_EQ(values(), (foundation::Dictionary{{"key", "--string"}}));
 }
 
-TEST_F(PrefsCommand, RefusesWhatWasMeantAsAnotherKindAndIsNone)
+TEST_F(PrefsCommand, RefusesWhatWasMeantAsAnotherKindButIsMalformed)
 {
     expectFailure({"prefs", "set", domain, "key", "[1, 2"},
-                  "[1, 2 begins like a value of TOML but is none: correct it, or say --string");
+                  "[1, 2 begins like a TOML value but is not valid: correct it, or use --string");
     expectFailure({"prefs", "set", domain, "key", "99999999999999999999"},
-                  "99999999999999999999 does not fit in 64 bits: say --string to keep it as text");
+                  "99999999999999999999 does not fit in 64 bits: use --string to keep it as text");
     EXPECT_FALSE(fs::exists(file));
 }
 
@@ -223,7 +223,7 @@ TEST_F(PrefsCommand, CannotSayInJsonWhatJsonHasNot)
     write("a = nan\n");
     EXPECT_EQ(tool.print({"prefs", "list", domain}), "a = nan\n");
     expectFailure({"prefs", "get", "--json", domain, "a"},
-                  "a number is not finite, which JSON cannot say: try without --json");
+                  "a number is not finite, which JSON cannot express: try without --json");
 }
 
 TEST_F(PrefsCommand, UnsetsAKeyAndNothingElse)
@@ -235,16 +235,14 @@ TEST_F(PrefsCommand, UnsetsAKeyAndNothingElse)
     EXPECT_EQ(support::readFile(file), "# first\nb = 2\n\n");
 }
 
-// --- what can be wrong
+// --- failures
 
-TEST_F(PrefsCommand, SaysThatThereIsNoSuchDomainOrKey)
+TEST_F(PrefsCommand, SaysThatTheDomainOrKeyIsMissing)
 {
     const std::string preferences = file.parent_path();
     for (const char* verb : {"get", "unset"})
-        expectFailure({"prefs", verb, domain, "a"},
-                      "there are no preferences of the domain com.quarn.kesto in " + preferences);
-    expectFailure({"prefs", "list", domain},
-                  "there are no preferences of the domain com.quarn.kesto in " + preferences);
+        expectFailure({"prefs", verb, domain, "a"}, "the domain com.quarn.kesto has no preferences in " + preferences);
+    expectFailure({"prefs", "list", domain}, "the domain com.quarn.kesto has no preferences in " + preferences);
     write("b = 1\n");
     for (const char* verb : {"get", "unset"})
         expectFailure({"prefs", verb, domain, "a"}, "the domain com.quarn.kesto has no key \"a\" in " + file.native());
@@ -303,7 +301,7 @@ TEST_F(PrefsCommand, SaysWhenSomethingElseStandsThere)
                   "cannot make " + (directory.path() / "plain/preferences").native() + ": Not a directory");
 }
 
-TEST_F(PrefsCommand, FindsTheDirectoryWhereItIsTold)
+TEST_F(PrefsCommand, FindsTheDirectoryThatIsNamed)
 {
     const fs::path home = directory.path() / "home/.config/kesto";
     fs::create_directories(home);
@@ -316,7 +314,7 @@ TEST_F(PrefsCommand, FindsTheDirectoryWhereItIsTold)
     EXPECT_EQ(tool.print({"prefs", "get", "--directory", home, domain, "a"}), "1\n");
 }
 
-// --- the road to a session
+// --- the path to a session
 
 TEST(PrefsRoad, AChangeReachesASessionAndItsSummary)
 {

@@ -58,7 +58,7 @@ TEST(TomlValue, IsNothingElse)
 
 RC_GTEST_PROP(TomlString, ReadsBackAsTheText, ())
 {
-    // Characters from all over, those that mean something most of all.
+    // Characters of all kinds, mostly those with a meaning in TOML.
     const auto characters = *rc::gen::container<std::vector<std::string>>(rc::gen::element<std::string>(
         "a", "\"", "'", "\\", "\n", "\r", "\t", "\x01", "\x1B", "\x7F", "#", "=", "[", "é", "\xC2\x80", "\xC2\x8F",
         "\xC2\x90", "\xC2\x9B", "\xC2\x9F", "\xC2\xA0", "😀"));
@@ -110,7 +110,7 @@ TEST(WithTomlKey, TakesThePlaceOfTablesOfThatName)
               "a = 1\nname = 5\n[e]\nname = 7\n");
 }
 
-TEST(WithTomlKey, IsNoKeyOfATable)
+TEST(WithTomlKey, IsNotAKeyOfATable)
 {
     EXPECT_EQ(withTomlKey("[t]\nname = 1\n", "name", "5"), "name = 5\n\n[t]\nname = 1\n");
 }

@@ -1,4 +1,4 @@
-// What a trace has measured, as a table and for programs.
+// The results of a trace, as a table and for programs.
 #include "end_to_end/Kestod.h"
 #include "tools/kesto/Tool.h"
 
@@ -140,7 +140,7 @@ TEST_F(TraceCommand, SaysWhatIsMissingBesideTheTableAndEndsWithAStatusOfItsOwn)
     }
 }
 
-TEST_F(TraceCommand, FailsOnWhatIsNoResultsFile)
+TEST_F(TraceCommand, FailsOnWhatIsNotAResultsFile)
 {
     const auto expectFailure = [this](const std::string& file, const std::string& reason) {
         const Finished finished = tool.run({"trace", file});
@@ -157,7 +157,7 @@ TEST_F(TraceCommand, FailsOnWhatIsNoResultsFile)
     ASSERT_EQ(::mkfifo(pipe.c_str(), 0600), 0);
     expectUnread(pipe, "it is not a regular file");
     const auto expectNoResults = [&](const std::string& file, const std::string& reason) {
-        expectFailure(file, file + " is no results file of a trace: " + reason);
+        expectFailure(file, file + " is not a results file of a trace: " + reason);
     };
     expectNoResults(write("[]"), "it is not an object");
     expectNoResults(writeRecords("1"), "its record 1 is not a name, a value and a unit");

@@ -1,5 +1,4 @@
-// A program to be measured: emits so many pairs of events, says what it was given, and ends with the status that it is
-// told.
+// A program to be measured: emits so many pairs of events, prints its arguments, and ends with the given status.
 //
 //     trace_emitter COUNT STATUS [WORD...]
 #include <chrono>

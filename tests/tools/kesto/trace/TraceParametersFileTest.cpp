@@ -1,4 +1,4 @@
-// What is said of a parameters file before anything is measured by it, and the copy that a service is given.
+// The warnings about a parameters file, and the copy for a service.
 #include "kesto/trace/TraceParametersFile.h"
 
 #include "support/TemporaryDirectory.h"
@@ -34,7 +34,7 @@ TEST(TraceParametersWarnings, AreNoneForPointsThatCanBeMeasured)
 
 TEST(TraceParametersWarnings, AreGivenForCodesThatAreNotCollected)
 {
-    const std::string outside = "point 1, \"a\": measures nothing, for the code ";
+    const std::string outside = "point 1, \"a\": measures nothing, because the code ";
     const std::string range = " is not from 0x21040000 to 0x2104408a";
     EXPECT_THAT(warningsOfPoint(interval(0x2103FFFF, 0x21040000)), ElementsAre(outside + "0x2103ffff" + range));
     EXPECT_THAT(warningsOfPoint(interval(0x21040000, 0x2104408B)), ElementsAre(outside + "0x2104408b" + range));
@@ -45,7 +45,7 @@ TEST(TraceParametersWarnings, AreGivenForCodesThatAreNotCollected)
 TEST(TraceParametersWarnings, AreGivenForWhatBeginsAndNeverEnds)
 {
     EXPECT_THAT(warningsOfPoint({"beat\x1B", TraceDataParams::impulse, 0x21040000, 0, false}),
-                ElementsAre("point 1, \"beat?\": measures nothing, for it begins and ends with one code"));
+                ElementsAre("point 1, \"beat?\": measures nothing, because it begins and ends with one code"));
 }
 
 TEST(TraceParametersWarnings, NameEachPointByItsPlace)
@@ -53,8 +53,8 @@ TEST(TraceParametersWarnings, NameEachPointByItsPlace)
     TraceDataParams unknown = interval(0x21040000, 0x21040004);
     unknown.isTypeKnown = false;
     EXPECT_THAT(warningsOf({.name = "", .traceDataParams = {interval(0x21040000, 0x21040004), unknown}}),
-                ElementsAre("point 2, \"a\": its type is none of Interval, Impulse and Level, so it is taken for one "
-                            "like the point before it"));
+                ElementsAre("point 2, \"a\": its type is not Interval, Impulse or Level, so it counts as one like the "
+                            "point before it"));
 }
 
 TEST(TraceParametersWarnings, AreGivenForTheFileAsAWhole)

@@ -1,5 +1,4 @@
-// A program that is measured while it runs, by a real service and a real kernel trace; and what is said where there is
-// none to be had.
+// A program that a real service measures with a real kernel trace; and the errors if no trace is available.
 #include "end_to_end/Kestod.h"
 #include "platform/linux/trace/RealTracefs.h"
 #include "tools/kesto/Tool.h"
@@ -33,7 +32,7 @@ const std::string step = point("step", "Interval", "21040010", "21040014");
 
 class TraceRecord : public testing::Test {
 protected:
-    static constexpr std::string_view noTrace = "this machine lets nobody trace";
+    static constexpr std::string_view noTrace = "this machine does not let this user trace";
 
     void SetUp() override
     {
@@ -68,7 +67,7 @@ protected:
         EXPECT_FALSE(std::filesystem::exists(path("touched")));
     }
 
-    // A service that traces; false where there is none to be had.
+    // Starts a service that traces; false if this machine cannot trace.
     [[nodiscard]] bool startTracingService()
     {
         if (tracefs.problem())
@@ -76,7 +75,7 @@ protected:
         enable();
         kestod.startAndAwait();
         static_cast<void>(record({}, {"true"}));
-        return !kestod.log().contains("there is no kernel trace: ");
+        return !kestod.log().contains("the kernel trace is not available: ");
     }
     [[nodiscard]] std::vector<std::string> namesInTraces() const
     {
@@ -86,7 +85,7 @@ protected:
         return names;
     }
 
-    const support::RealTracefs tracefs; // before the service, which is to see it
+    const support::RealTracefs tracefs; // before the service, which must find it
     end_to_end::Kestod kestod;
     Tool tool{kestod.directory()};
 };
@@ -96,7 +95,7 @@ TEST_F(TraceRecord, ShowsWhatAProgramEmitsAndPassesItsStatusOn)
     if (!startTracingService())
         GTEST_SKIP() << noTrace;
     const std::string copy = path("copy.qdj");
-    // Words as they are, whatever they look like to the tool.
+    // Words that the tool must pass on unchanged, even if they look like its own options.
     const Finished finished =
         recordEmitter({"--output", copy}, {"7", "5", "[a,b]", "", "--", "--params", "record", "trace", "{}"});
     EXPECT_EQ(finished.status, 5) << finished.errors;
@@ -170,12 +169,13 @@ TEST_F(TraceRecord, SaysBeforeTheProgramRunsWhatWillNotBeMeasured)
     EXPECT_EQ(finished.status, 0);
     EXPECT_EQ(finished.errors,
               warning
-                  + "point 2, \"again\": its type is none of Interval, Impulse and Level, so it is taken for one like "
-                    "the point before it\n"
+                  + "point 2, \"again\": its type is not Interval, Impulse or Level, so it counts as one like the "
+                    "point before it\n"
                   + warning
-                  + "point 3, \"far\": measures nothing, for the code 0x21050000 is not from 0x21040000 to "
+                  + "point 3, \"far\": measures nothing, because the code 0x21050000 is not from 0x21040000 to "
                     "0x2104408a\n"
-                  + warning + "point 4, \"beat\": measures nothing, for it begins and ends with one code\nrunning\n");
+                  + warning
+                  + "point 4, \"beat\": measures nothing, because it begins and ends with one code\nrunning\n");
 
     support::writeFile(path("home/steps.plist"), parametersWith(""));
     const Finished without = record({}, {"true"});
@@ -224,7 +224,7 @@ TEST_F(TraceRecord, ShowsTheResultsAlsoWhenNoCopyCanBeKept)
     EXPECT_THAT(device.errors, StartsWith("{\"project\":\"KestoReporting\""));
 }
 
-// --- what there is to be had
+// --- missing traces
 
 TEST_F(TraceRecord, DoesNotRunTheProgramWhenTheServiceDoesNotTrace)
 {
@@ -240,7 +240,7 @@ TEST_F(TraceRecord, DoesNotRunTheProgramWithoutAService)
 TEST_F(TraceRecord, DoesNotRunTheProgramWithoutParameters)
 {
     support::writeFile(path("home/steps.plist"), "<plist><dict>\n<key>");
-    expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist is no parameters file: line 2");
+    expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist is not a parameters file: line 2");
     std::filesystem::remove(path("home/steps.plist"));
     expectNothingIsRun(record({}, {"touch", path("touched")}), "steps.plist: No such file or directory");
 }

@@ -1,4 +1,4 @@
-// Results files as the service's writer makes them, and texts that are none.
+// Results files as the service's writer makes them, and other texts.
 #include "kesto/trace/TraceResultsFile.h"
 
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
@@ -17,7 +17,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
 
-// Whatever the service writes, the tool reads.
+// The tool reads everything that the service writes.
 class WrittenTraceResults : public testing::Test {
 protected:
     void write(const std::vector<std::pair<std::string, double>>& records)
@@ -118,7 +118,7 @@ TEST(TraceResultsText, KeepsUnitsApart)
     EXPECT_EQ(results->series[1].unit, "B");
 }
 
-TEST(TraceResultsText, MayHaveMembersThatNobodyKnows)
+TEST(TraceResultsText, MayHaveUnknownMembers)
 {
     const auto results = parseTraceResults(
         R"({"x":[{"name":1},[[]],"records"],"project":"P","y":{"records":[7],"project":2},"version":4,"z":null,"records":[
@@ -134,7 +134,7 @@ std::string problemOf(const std::string& text)
     return results ? "none" : results.error();
 }
 
-TEST(TraceResultsText, IsRefusedWithTheReasonWhenItIsNone)
+TEST(TraceResultsText, IsRefusedWithTheReasonWhenItIsMalformed)
 {
     EXPECT_EQ(problemOf(""), "not JSON: The document is empty. (at byte 1)");
     EXPECT_EQ(problemOf("[]"), "it is not an object");
@@ -154,7 +154,7 @@ TEST(TraceResultsText, IsRefusedWithTheReasonWhenItIsNone)
     EXPECT_EQ(problemOf("{\"project\":\"\xFF\"}"), "not JSON: Invalid encoding in string. (at byte 13)");
 }
 
-TEST(TraceResultsText, IsRefusedWithTheNumberOfARecordThatIsNone)
+TEST(TraceResultsText, IsRefusedWithTheNumberOfAMalformedRecord)
 {
     const std::string right = R"({"name":"a","value":1,"unit":"ns"})";
     for (const char* wrong : {"1", "null", "[]", "{}", R"({"name":"a","value":1})", R"({"name":"a","unit":"ns"})",

@@ -1,4 +1,4 @@
-// Percentiles and histograms of a few values by hand, and of any by what must hold for all.
+// Percentiles and histograms of a few values by hand, and properties for all values.
 #include "kesto/trace/TraceStatistics.h"
 
 #include <algorithm>
