@@ -27,7 +27,8 @@ public:
 
     // Sends [call, error, values...].
     template <typename... Values>
-    void operator()(platform::Turn& turn, const std::optional<KestoReportingError>& error, const Values&... values) const
+    void operator()(platform::Turn& turn, const std::optional<KestoReportingError>& error,
+                    const Values&... values) const
     {
         std::string frame;
         foundation::appendCborArrayHead(2 + sizeof...(values), frame);
