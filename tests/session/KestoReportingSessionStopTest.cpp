@@ -107,7 +107,7 @@ TEST_F(SessionStop, CountsAsStartedUntilItIsOver)
     platform.log.setObserver([&](const support::LogLine&) { started.push_back(session->started()); });
     platform.analytics.setObserver([&](const std::string&) { started.push_back(session->started()); });
     platform.traceMarkers.setObserver([&](std::uint32_t) { started.push_back(session->started()); });
-    session->stop();
+    session->stop(platform.turn);
     platform.log.setObserver(nullptr);
     platform.analytics.setObserver(nullptr);
     platform.traceMarkers.setObserver(nullptr);
@@ -301,7 +301,7 @@ TEST_F(SessionStop, TellsHowMuchMemoryItLetGo)
 {
     send(0, {{"a", std::string(100'000, 'x')}});
     EXPECT_EQ(platform.memory.bytesLetGo(), 0U);
-    session->stop();
+    session->stop(platform.turn);
     EXPECT_GT(platform.memory.bytesLetGo(), 100'000U);
     EXPECT_LT(platform.memory.bytesLetGo(), 500'000U);
 }

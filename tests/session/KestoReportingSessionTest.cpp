@@ -366,7 +366,7 @@ TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
 {
     session->start();
     session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
-    session->stop();
+    session->stop(platform.turn);
     std::optional<std::size_t> messages;
     platform.traceMarkers.setObserver([&](std::uint32_t code) {
         EXPECT_EQ(code, started);
@@ -416,7 +416,7 @@ TEST_F(SessionTest, SaysTwiceThatItEndsBeforeItMarksIt)
     std::vector<std::string> steps;
     platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
     platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
-    session->stop();
+    session->stop(platform.turn);
     platform.log.setObserver(nullptr);
     platform.traceMarkers.setObserver(nullptr);
     ASSERT_THAT(steps, SizeIs(testing::Ge(3U)));

@@ -62,7 +62,7 @@ TEST_F(LinuxPlatformTest, PreferencesThatChangePostTheNotificationOfTheirDomain)
         LinuxPlatform providers(launch());
         const Platform platform = providers.platform();
         const auto posted = std::make_shared<std::promise<void>>();
-        const auto queue = platform.workQueues.makeSerialQueue("posts", QualityOfService::Default);
+        const auto queue = platform.workQueues.makeSerialQueue("posts", {});
         platform.notifications.registerNotification(notification, queue,
                                                     [posted](std::int32_t) { posted->set_value(); });
         fs::create_directories(make("etc") / "preferences");

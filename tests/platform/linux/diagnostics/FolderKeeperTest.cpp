@@ -282,7 +282,7 @@ TEST_F(FolderKeeper, SaysThatItCannotRemoveWhatAKilledServiceHadBegunToWrite)
     make(".kestod-0123456789abcdef.tmp", 0);
     EXPECT_TRUE(isTrueWithoutRightToRemove([&] {
         files.removeUnfinished(folder);
-        return hasSaidOnly("what a service which was killed had begun to write in " + folder.string()
+        return hasSaidOnly("the unfinished files of a killed service in " + folder.string()
                            + " cannot be removed (Permission denied)");
     }));
     EXPECT_THAT(names(), ElementsAre(".kestod-0123456789abcdef.tmp"));

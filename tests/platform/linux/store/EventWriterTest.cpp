@@ -551,7 +551,7 @@ TEST_F(EventWriterTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
 
 TEST_F(EventWriterTest, WithoutADatabaseNothingIsLeftToTidy)
 {
-    EXPECT_FALSE(writer().maintain(true));
+    EXPECT_FALSE(writer().tidy(true));
     EXPECT_FALSE(writer().awaitsQuiet());
 }
 

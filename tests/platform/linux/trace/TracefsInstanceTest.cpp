@@ -185,7 +185,7 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenPagesWouldHoldLessThanTheirHeadOrNothin
     EXPECT_EQ(problemWithOffset("4095"), "");
     EXPECT_EQ(problemWithOffset("16"), "");
     for (const char* offset : {"0", "15", "4096", "5000", "9223372036854775807"})
-        EXPECT_THAT(problemWithOffset(offset), EndsWith("events/header_page is not as this service knows it"))
+        EXPECT_THAT(problemWithOffset(offset), EndsWith("events/header_page has another form than this service expects"))
             << offset;
 }
 
@@ -200,7 +200,7 @@ TEST_F(TracefsInstanceTest, HasPagesOfKernelsWith32Or64Bits)
     };
     for (const char* size : {"3", "5", "7", "9"}) {
         setCommitSize(size);
-        EXPECT_THAT(problem(), EndsWith("events/header_page is not as this service knows it")) << size;
+        EXPECT_THAT(problem(), EndsWith("events/header_page has another form than this service expects")) << size;
     }
     setCommitSize("4");
     const auto instance = open();

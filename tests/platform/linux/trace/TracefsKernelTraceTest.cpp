@@ -295,7 +295,7 @@ TEST_F(TracefsKernelTraceTest, HasTheFirstInstanceThatNoneOfSevenOtherServicesHa
         EXPECT_FALSE(trace.isAvailable());
         EXPECT_THAT(log.take(),
                     ElementsAre(IsLine(LogLevel::Error, "kerl",
-                                       "there is no kernel trace: " + (folder / next).string()
+                                       "the kernel trace is not available: " + (folder / next).string()
                                            + "/tracing_on cannot be written: No such file or directory")))
             << "it is made, but has no files in this tree";
         takeByAnother(next);
@@ -303,7 +303,7 @@ TEST_F(TracefsKernelTraceTest, HasTheFirstInstanceThatNoneOfSevenOtherServicesHa
     EXPECT_FALSE(trace.isAvailable());
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(LogLevel::Error, "kerl",
-                                   "there is no kernel trace: " + (folder / "kesto-8").string()
+                                   "the kernel trace is not available: " + (folder / "kesto-8").string()
                                        + " belongs to another service that runs")));
     EXPECT_FALSE(fs::exists(folder / "kesto-9"));
 }
