@@ -124,7 +124,7 @@ std::expected<TracefsInstance, TracefsFailure> TracefsInstance::open(const fs::p
     if (!instance.directory_)
         return std::unexpected(failure(path, "cannot be opened", errno));
     if (::flock(instance.directory_.get(), LOCK_EX | LOCK_NB) != 0)
-        return std::unexpected(TracefsFailure{.what = path.native() + "is in use by another running service",
+        return std::unexpected(TracefsFailure{.what = path.native() + " is in use by another running service",
                                               .isInUse = errno == EWOULDBLOCK});
     if (const auto done = instance.setUp(path); !done)
         return std::unexpected(done.error());

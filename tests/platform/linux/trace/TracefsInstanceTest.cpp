@@ -116,7 +116,7 @@ TEST_F(TracefsInstanceTest, BelongsToOneServiceAtATime)
     const auto second = open();
     ASSERT_FALSE(second);
     EXPECT_TRUE(second.error().isInUse);
-    EXPECT_THAT(second.error().what, EndsWith("instances/kestois in use by another running service"));
+    EXPECT_THAT(second.error().what, EndsWith("instances/kesto is in use by another running service"));
     {
         const TracefsInstance gone = *std::move(instance);
     }

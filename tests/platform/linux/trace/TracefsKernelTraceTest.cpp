@@ -304,7 +304,7 @@ TEST_F(TracefsKernelTraceTest, HasTheFirstInstanceThatNoneOfSevenOtherServicesHa
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(LogLevel::Error, "kerl",
                                    "the kernel trace is not available: " + (folder / "kesto-8").string()
-                                       + " belongs to another service that runs")));
+                                       + " is in use by another running service")));
     EXPECT_FALSE(fs::exists(folder / "kesto-9"));
 }
 
