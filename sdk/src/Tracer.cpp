@@ -43,6 +43,8 @@ bool isPage(const FileDescriptor& file) noexcept
         && seals >= 0 && (seals & F_SEAL_SHRINK) != 0;
 }
 
+constexpr int emptyPage = MAP_PRIVATE | MAP_ANONYMOUS;
+
 // Maps a page for reading; with MAP_FIXED it takes the place of the one that is there.
 void* mapPage(void* place, int flags, int file) noexcept
 {
@@ -58,9 +60,13 @@ std::unique_ptr<Tracer> Tracer::create()
 {
     std::unique_ptr<Tracer> tracer(new Tracer);
     tracer->nowhere_ = FileDescriptor(::open("/", O_PATH | O_CLOEXEC));
-    if (!tracer->nowhere_ || !tracer->mapEmptyPage(0))
+    void* const page = mapPage(nullptr, emptyPage, -1);
+    if (page == MAP_FAILED)
         return nullptr;
-    tracer->marker_ = FileDescriptor(::fcntl(tracer->nowhere_.get(), F_DUPFD_CLOEXEC, 0));
+    tracer->page_ = page;
+    tracer->is_tracing = &static_cast<const TraceMarkerPage*>(page)->isTracing;
+    if (tracer->nowhere_)
+        tracer->marker_ = FileDescriptor(::fcntl(tracer->nowhere_.get(), F_DUPFD_CLOEXEC, 0));
     return tracer->marker_ ? std::move(tracer) : nullptr;
 }
 
@@ -68,16 +74,6 @@ Tracer::~Tracer()
 {
     if (page_ != nullptr)
         ::munmap(page_, TraceMarkerPage::size);
-}
-
-bool Tracer::mapEmptyPage(int flags) noexcept
-{
-    void* const page = mapPage(page_, MAP_PRIVATE | MAP_ANONYMOUS | flags, -1);
-    if (page == MAP_FAILED)
-        return false;
-    page_ = page;
-    is_tracing = &static_cast<const TraceMarkerPage*>(page)->isTracing;
-    return true;
 }
 
 void Tracer::emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) const noexcept
@@ -101,7 +97,7 @@ bool Tracer::attach(TraceDescriptors descriptors) noexcept
 void Tracer::detach() noexcept
 {
     static_cast<void>(::dup3(nowhere_.get(), marker_.get(), O_CLOEXEC));
-    static_cast<void>(mapEmptyPage(MAP_FIXED));
+    static_cast<void>(mapPage(page_, emptyPage | MAP_FIXED, -1));
 }
 
 } // namespace libkesto

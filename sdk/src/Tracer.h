@@ -37,7 +37,6 @@ public:
 
 private:
     Tracer() noexcept : kesto_tracer{} { }
-    [[nodiscard]] bool mapEmptyPage(int flags) noexcept;
 
     void* page_ = nullptr;
     platform::FileDescriptor nowhere_; // open, but not for writing
