@@ -185,7 +185,8 @@ TEST_F(TracefsInstanceTest, IsNotUsedWhenPagesWouldHoldLessThanTheirHeadOrNothin
     EXPECT_EQ(problemWithOffset("4095"), "");
     EXPECT_EQ(problemWithOffset("16"), "");
     for (const char* offset : {"0", "15", "4096", "5000", "9223372036854775807"})
-        EXPECT_THAT(problemWithOffset(offset), EndsWith("events/header_page has another form than this service expects"))
+        EXPECT_THAT(problemWithOffset(offset),
+                    EndsWith("events/header_page has another form than this service expects"))
             << offset;
 }
 
