@@ -69,7 +69,6 @@ private:
                 complete();
             });
         }
-        [[nodiscard]] std::uint64_t lostEvents() const override { return 0; }
         [[nodiscard]] std::uint64_t timestampToNanoseconds(std::uint64_t timestamp) const override { return timestamp; }
 
     private:
