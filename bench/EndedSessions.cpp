@@ -22,7 +22,7 @@ constexpr std::array<std::int64_t, 3> reporters{2, 3, 4};
 constexpr std::chrono::seconds settling(1);
 constexpr std::chrono::seconds patience(10); // what the service promises to need at most
 
-// A client that reads its answers, whatever they say.
+// A client that reads its answers and ignores their content.
 class Player {
 public:
     explicit Player(const ServiceProcess& service) : socket_(service.connect()) { }
@@ -50,7 +50,7 @@ private:
 
     void call(int method, std::initializer_list<foundation::Value> arguments)
     {
-        constexpr int number = 1; // the same for all, for nobody tells the answers apart
+        constexpr int number = 1; // the same for all calls: the client does not look at it
         std::vector<foundation::Value> call{number, method};
         call.insert(call.end(), arguments);
         writeAll(socket_.get(), frame(foundation::Array(std::move(call))));
@@ -97,7 +97,7 @@ void measureEndedSessions(const Options& options, Report& report)
         showProgress(fmt::format("sessions that ended: service {} of {}", round + 1, options.rounds));
         const auto& service = services.emplace_back(options, "used = []", ServiceProcess::Build::Internal);
         auto& player = players.emplace_back(service);
-        player.play(1, 10); // whatever is there from the first session on
+        player.play(1, 10); // allocates what later sessions share
         std::this_thread::sleep_for(settling);
         before.push_back(residentMegabytes(service.identifier()));
         for (const std::int64_t reporter : reporters)

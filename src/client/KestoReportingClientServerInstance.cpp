@@ -119,7 +119,7 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
     });
 }
 
-// The first is told, so that the log shows it while it can still be helped; a client may make any number of them.
+// The log has a line for the first, in time for the administrator to act; a client may cause any number of them.
 void KestoReportingClientServerInstance::countRefusedSession()
 {
     if (sessionsRefused_++ == 0)

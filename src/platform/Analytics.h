@@ -18,10 +18,10 @@ public:
     virtual ~Analytics() = default;
     // Whether the device keeps events of that name now.
     [[nodiscard]] virtual bool isAnalyticsEventUsed(std::string_view eventName) = 0;
-    // Sends an event: with the turn, which is kept as a whole when it is over, or outside of any, at once. Of the
-    // events of one turn the order is kept, and of those that one thread sends outside of turns. The builder is called
-    // only if and when the payload is needed, once, on any thread. An event that nobody wants now is dropped with its
-    // builder; one whose payload holds a number that is not finite is lost.
+    // Sends an event: in the turn, whose events are stored together when it ends, or outside any turn, at once. The
+    // events of one turn keep their order, and so do the events that one thread sends outside turns. The service calls
+    // the builder at most once, on any thread, when it needs the payload. It drops an unwanted event with its builder,
+    // and loses an event whose payload holds a number that is not finite.
     virtual void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
     virtual void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
 };

@@ -164,7 +164,7 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
     EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers));
     EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1002)).Times(1));
     EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered));
-    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1)) << "the first is told";
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1)) << "the log has the first";
 
     platform.analytics.clear();
     player.close();

@@ -212,7 +212,7 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanItMayHave)
                                 "ones are counted until it goes");
     EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 10001"), refused));
     EXPECT_EQ(create(most + 2), answeredOnce(succeeded));
-    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused).Times(1)) << "the first is told, all count";
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused).Times(1)) << "the log has the first, all count";
     const auto replaced = player.session(1);
     EXPECT_EQ(create(1), answeredOnce(succeeded));
     EXPECT_NE(player.session(1), replaced) << "one that is there already may be replaced";

@@ -1,7 +1,7 @@
 // What is checked before a message is taken, and in which order things go when a client goes.
 #include "calls/Client.h"
 
-#include "BlockedSignals.h"
+#include "Threads.h"
 #include "client/KestoReportingOperations.h"
 
 #include <algorithm>
@@ -36,17 +36,9 @@ kesto_client::kesto_client(Settings settings, platform::FileDescriptor doorbell)
 }
 
 bool kesto_client::start() noexcept
-try {
-    const libkesto::BlockedSignals blocked;
+{
     const foundation::Lock lock(joining_);
-    thread_ = std::thread([this] { run(); });
-    return true;
-} catch (const std::system_error& error) {
-    errno = error.code().value();
-    return false;
-} catch (const std::bad_alloc&) {
-    errno = ENOMEM;
-    return false;
+    return libkesto::startThread(thread_, [this] { run(); });
 }
 
 void kesto_client::run() noexcept

@@ -2,7 +2,7 @@
 // mark and the bell.
 #include "channels/Publisher.h"
 
-#include "BlockedSignals.h"
+#include "Threads.h"
 #include "platform/linux/channels/ChannelOwner.h"
 
 #include <algorithm>
@@ -47,16 +47,8 @@ std::unique_ptr<kesto_publisher> kesto_publisher::create(Settings settings)
 }
 
 bool kesto_publisher::start() noexcept
-try {
-    const libkesto::BlockedSignals blocked;
-    thread_ = std::thread([this] { run(); });
-    return true;
-} catch (const std::system_error& error) {
-    errno = error.code().value();
-    return false;
-} catch (const std::bad_alloc&) {
-    errno = ENOMEM;
-    return false;
+{
+    return libkesto::startThread(thread_, [this] { run(); });
 }
 
 kesto_publisher::~kesto_publisher()

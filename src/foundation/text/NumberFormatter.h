@@ -5,8 +5,8 @@
 
 namespace foundation {
 
-// The number in fixed notation, rounded half to even to `maximumFractionDigits`, its trailing zeros
-// dropped down to `minimumFractionDigits` or, where that is less, to the maximum; "." whatever the locale. Any thread.
+// The number in fixed notation, rounded half to even to `maximumFractionDigits`. Trailing zeros are dropped down to
+// `minimumFractionDigits`, or to the maximum if that is smaller. The separator is "." in every locale. Any thread.
 [[nodiscard]] std::string formatDecimal(double number, unsigned minimumFractionDigits, unsigned maximumFractionDigits);
 
 } // namespace foundation

@@ -1,4 +1,4 @@
-// The contract of platform/BugCapture.h: what a signature holds, what is asked of whoever asks for a snapshot, and when
+// The contract of platform/BugCapture.h: what a signature holds, what a caller passes with a request, and when
 // the answer comes.
 #include "platform/contract/Contract.h"
 #include "platform/linux/bugs/LinuxBugCapture.h"

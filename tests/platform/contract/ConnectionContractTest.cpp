@@ -569,7 +569,7 @@ TEST_P(ConnectionContract, LetsACallOutliveIt)
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
     ASSERT_THAT(record->calls, SizeIs(1));
-    support::sendAtOnce(*record->calls[0].caller, answer(1)); // which nobody reads
+    support::sendAtOnce(*record->calls[0].caller, answer(1)); // the peer does not read it
     const std::weak_ptr<Connection> connection = record->connection;
     record->connection.reset();
     EXPECT_FALSE(connection.expired()) << "code that works on a call holds its caller";

@@ -1,4 +1,4 @@
-// The system's error numbers: as errors to hand on, and what they mean, in the same words whatever the locale.
+// The system's error numbers, as std::error_code and as text that is the same in every locale.
 #pragma once
 
 #include <cerrno>

@@ -10,7 +10,7 @@
 
 namespace platform {
 
-// Any thread. Serial queues live as long as whoever made them wants, also longer than this.
+// Any thread. A serial queue lives as long as its owner keeps it, even longer than this.
 class LinuxWorkQueues final : public WorkQueues {
 public:
     // Takes what each turn of a turn queue has gathered, on the thread that ran the turn. Set before such a queue is

@@ -1,4 +1,4 @@
-// A listener on a private socket with a delegate that keeps what it is told.
+// A listener on a private socket, with a delegate that records its calls.
 #pragma once
 
 #include "foundation/Mutex.h"

@@ -1,4 +1,4 @@
-// Every reason for which events are lost, in the words in which its owner is told: at once, and at the end at the
+// Every reason for which events are lost, in the words that the log has for it: at once, and at the end at the
 // latest.
 #include "platform/linux/store/EventLosses.h"
 
