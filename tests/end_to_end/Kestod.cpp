@@ -145,6 +145,7 @@ std::expected<std::vector<StoredEvent>, std::string> Kestod::readEvents(std::str
     sqlite3* database = nullptr;
     sqlite3_stmt* query = nullptr;
     int status = sqlite3_open_v2(path.c_str(), &database, SQLITE_OPEN_READONLY, nullptr);
+    sqlite3_busy_timeout(database, 10'000); // the service locks it while it opens or closes it
     if (status == SQLITE_OK)
         status = sqlite3_prepare_v2(database, "SELECT name, payload FROM events WHERE name GLOB ?1 ORDER BY id", -1,
                                     &query, nullptr);

@@ -139,7 +139,7 @@ TEST_F(BugEvidenceTest, BytesThatAreNotTextAreReplacedInNamesAsInTheProcessTable
 
 TEST_F(BugEvidenceTest, FindsThisProcessInTheRealTable)
 {
-    const Dictionary evidence = processEvidence("/proc", LinuxProcessTable().ownProcessName());
+    const Dictionary evidence = processEvidence("/proc", LinuxProcessTable().ownProcessName(), ::getpid());
     EXPECT_THAT(pids(evidence), testing::Contains(::getpid()));
 }
 
