@@ -2,7 +2,7 @@
 // payload compared with a list of byte strings.
 #include "Groups.h"
 #include "foundation/cbor/Cbor.h"
-#include "session/KestoReportingMessageStore.h"
+#include "session/MessageStore.h"
 #include "support/InProcessPlatform.h"
 #include "support/SampleMessage.h"
 
@@ -68,7 +68,7 @@ constexpr std::size_t keptEach = 20'000;
 
 double costOfStore(const std::vector<foundation::Dictionary>& messages)
 {
-    KestoReportingMessageStore store(KestoReportingStorageBudget::service());
+    session::MessageStore store(session::StorageBudget::service());
     return nanosecondsEach(messages.size(),
                            [&](std::size_t each) { (void)store.record(sampleCategory, sampleType, messages[each]); });
 }

@@ -2,7 +2,7 @@
 // its mask.
 #include "Groups.h"
 #include "support/InProcessPlatform.h"
-#include "utility/KestoReportingLogCategories.h"
+#include "utility/LogCategories.h"
 
 #include <fmt/ranges.h>
 #include <syslog.h>

@@ -74,11 +74,11 @@ template <typename Work> Contestant millisecondsOf(Work work)
 
 void measureAnalysis(const Options& options, Report& report)
 {
-    KestoReportingMessageStore store(KestoReportingStorageBudget::service());
+    session::MessageStore store(session::StorageBudget::service());
     sendMessages([&](const auto& message) { use(store.record(sampleCategory, sampleType, message)); });
     const std::optional<foundation::Value> process("player");
     const auto times = compete(options, "combining and volume analysis", millisecondsOf([&] {
-                                   KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+                                   session::StorageShare share(session::StorageBudget::service());
                                    use(KestoReportingSession::createVolumeMessages(store, process, 0.5, share));
                                }));
     std::vector<double> each;
@@ -102,7 +102,7 @@ std::size_t allocated()
 void measureVolumeEvents(const Options& options, Report& report)
 {
     constexpr int changeCount = 200'000;
-    KestoReportingMessageStore store(KestoReportingStorageBudget::service());
+    session::MessageStore store(session::StorageBudget::service());
     for (int change = 0; change <= changeCount; ++change)
         use(store.record(sampleCategory, sampleType,
                          {{"session_output_running", true},
@@ -114,7 +114,7 @@ void measureVolumeEvents(const Options& options, Report& report)
     std::vector<double> paidBytes;
     for (int round = 0; round < options.rounds; ++round) {
         ::malloc_trim(0);
-        KestoReportingStorageShare share(KestoReportingStorageBudget::service());
+        session::StorageShare share(session::StorageBudget::service());
         const std::size_t before = allocated();
         const auto start = Clock::now();
         const auto events = KestoReportingSession::createVolumeMessages(store, process, 0.5, share);

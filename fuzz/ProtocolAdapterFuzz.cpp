@@ -5,8 +5,8 @@
 // Which of the two it is, the table of the operations tells.
 //
 // The input is one CBOR item.
-#include "client/KestoReportingOperations.h"
-#include "client/KestoReportingServiceProtocolAdapter.h"
+#include "client/ServiceOperations.h"
+#include "client/ServiceProtocolAdapter.h"
 #include "foundation/cbor/Cbor.h"
 
 #include <algorithm>
@@ -48,11 +48,11 @@ public:
     }
     void startReportingSessionForID(std::int64_t, SuccessReply reply) override { answer(reply, true); }
     void sendMessage(Dictionary message, AudioEventCategory, std::uint16_t, std::optional<ReporterIDs> reporterIDs,
-                     KestoReportingReply reply) override
+                     utility::Reply reply) override
     {
         ++calls;
-        require(!reporterIDs || reporterIDs->size() <= KestoReportingMostReportersOfAMessage);
-        reply(turn, message.empty() ? std::optional(KestoReportingErrorDisabled) : std::nullopt);
+        require(!reporterIDs || reporterIDs->size() <= client::mostReportersOfAMessage);
+        reply(turn, message.empty() ? std::optional(utility::reportingDisabled) : std::nullopt);
     }
     void stopReportingSessionForID(std::int64_t, SuccessReply reply) override { answer(reply, true); }
     void destroyReportingSession(std::int64_t, SuccessReply reply) override { answer(reply, true); }
@@ -94,38 +94,38 @@ public:
     std::vector<std::string> sent;
 };
 
-bool fits(KestoReportingArgument argument, const Value& value)
+bool fits(client::OperationArgument argument, const Value& value)
 {
     switch (argument) {
-    case KestoReportingArgument::ReporterID: return value.exactly<std::int64_t>().has_value();
-    case KestoReportingArgument::ServiceType:
-    case KestoReportingArgument::Type: return value.exactly<std::uint16_t>().has_value();
-    case KestoReportingArgument::Category: return value.exactly<std::uint32_t>().has_value();
-    case KestoReportingArgument::Configuration:
-    case KestoReportingArgument::Message: return value.dictionary().has_value();
-    case KestoReportingArgument::ReporterIDs: break;
+    case client::OperationArgument::ReporterID: return value.exactly<std::int64_t>().has_value();
+    case client::OperationArgument::ServiceType:
+    case client::OperationArgument::Type: return value.exactly<std::uint16_t>().has_value();
+    case client::OperationArgument::Category: return value.exactly<std::uint32_t>().has_value();
+    case client::OperationArgument::Configuration:
+    case client::OperationArgument::Message: return value.dictionary().has_value();
+    case client::OperationArgument::ReporterIDs: break;
     }
     const auto array = value.array();
-    return array ? array->size() <= KestoReportingMostReportersOfAMessage
+    return array ? array->size() <= client::mostReportersOfAMessage
             && std::ranges::all_of(*array, [](const Value& id) { return id.exactly<std::int64_t>().has_value(); })
                  : value.isNull();
 }
 
 // The operation that the frame calls; null pointer when the frame is not a call.
-const KestoReportingOperation* operationOf(std::span<const Value> frame)
+const client::ServiceOperation* operationOf(std::span<const Value> frame)
 {
     if (frame.size() < 2 || !frame[0].exactly<std::uint64_t>())
         return nullptr;
-    const auto* operation = KestoReportingOperationNumbered(frame[1].exactly<std::int64_t>().value_or(0));
+    const auto* operation = client::serviceOperationNumbered(frame[1].exactly<std::int64_t>().value_or(0));
     return operation != nullptr && std::ranges::equal(operation->arguments(), frame.subspan(2), fits) ? operation
                                                                                                       : nullptr;
 }
 
-void requireIsAnswerTo(const Array& call, std::string_view frame, KestoReportingResult result)
+void requireIsAnswerTo(const Array& call, std::string_view frame, client::OperationResult result)
 {
     foundation::CborDecoder decoder;
     const auto answer = decoder.decode(frame)->array();
-    const std::size_t size = result == KestoReportingResult::None ? 2 : 3;
+    const std::size_t size = result == client::OperationResult::None ? 2 : 3;
     require(answer && answer->size() == size && (*answer)[0] == call[0]);
     require((*answer)[1].isNull() || ((*answer)[1].array() && size == 2));
 }
@@ -142,10 +142,10 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
 
     const auto protocol = std::make_shared<AnsweringProtocol>();
     const auto connection = std::make_shared<KeepingConnection>();
-    KestoReportingServiceProtocolAdapter adapter(protocol);
+    client::ServiceProtocolAdapter adapter(protocol);
     const auto result = adapter.handleCall({*call, connection});
 
-    const KestoReportingOperation* operation = operationOf(call->values());
+    const client::ServiceOperation* operation = operationOf(call->values());
     require(result.has_value() == (operation != nullptr));
     require(connection.use_count() == 1); // nobody answers later
     require(protocol->calls == (result ? 1 : 0));

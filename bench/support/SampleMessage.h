@@ -3,7 +3,7 @@
 #pragma once
 
 #include "foundation/values/Value.h"
-#include "utility/KestoReportingVocabulary.h"
+#include "utility/MessageKinds.h"
 
 #include <cstdint>
 #include <string>

@@ -2,9 +2,9 @@
 #include "client/KestoReportingClientServerInstance.h"
 
 #include "foundation/text/Format.h"
-#include "utility/KestoReportingServerQueue.h"
-#include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
+#include "utility/ServiceTraceCodes.h"
 
 #include <algorithm>
 #include <cstdlib>
@@ -25,8 +25,8 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
     std::int32_t processIdentifier, std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate)
     : processIdentifier_(processIdentifier),
       delegate_(std::move(delegate)),
-      budget_(std::make_shared<KestoReportingStorageBudget>(KestoReportingStorageBudget::clientLimit,
-                                                            KestoReportingStorageBudget::service()))
+      budget_(std::make_shared<session::StorageBudget>(session::StorageBudget::clientLimit,
+                                                       session::StorageBudget::service()))
 {
     KESTO_LOG(KestoReportingClientCategory(), Default, "new client with pid {}", processIdentifier_);
 }
@@ -72,7 +72,7 @@ void KestoReportingClientServerInstance::setClientProcessName(std::optional<std:
 std::shared_ptr<KestoReportingSession>
 KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t reporterID, bool acrossAllClients) const
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     if (auto session = clientReportingSessionMap_.find(reporterID))
         return session;
     const auto delegate = acrossAllClients ? delegate_.lock() : nullptr;
@@ -81,7 +81,7 @@ KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t repor
 
 void KestoReportingClientServerInstance::addSession(std::int64_t reporterID, Session session)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     const std::size_t before = clientReportingSessionMap_.size();
     clientReportingSessionMap_.set(reporterID, std::move(session));
     sessionsOfTheService += clientReportingSessionMap_.size() - before;
@@ -91,7 +91,7 @@ void KestoReportingClientServerInstance::addSession(std::int64_t reporterID, Ses
 
 void KestoReportingClientServerInstance::removeSession(std::int64_t reporterID)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     const std::size_t before = clientReportingSessionMap_.size();
     clientReportingSessionMap_.remove(reporterID);
     sessionsOfTheService -= before - clientReportingSessionMap_.size();
@@ -103,7 +103,7 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
 {
     submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "creating session for reporter {}", reporterID);
-        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientCreate);
+        utility::emitTraceCode(utility::ServiceTraceCode::ClientCreate);
         const bool replaces = self.clientReportingSessionMap_.find(reporterID) != nullptr;
         const bool isRoom =
             self.clientReportingSessionMap_.size() < mostSessions && sessionsOfTheService < mostSessionsOfTheService;
@@ -174,7 +174,7 @@ void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t
 {
     submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "starting session for reporter {}", reporterID);
-        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientStart);
+        utility::emitTraceCode(utility::ServiceTraceCode::ClientStart);
         const auto delegate = self.delegate_.lock();
         const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false);
         if (!session || session->started() || !delegate)
@@ -202,7 +202,7 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
 {
     submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "stopping session for reporter {}", reporterID);
-        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientStop);
+        utility::emitTraceCode(utility::ServiceTraceCode::ClientStop);
         if (reporterID == 0)
             return reply(turn, std::nullopt, true);
         const auto session = self.findReportingSessionForID(reporterID, false);
@@ -230,7 +230,7 @@ void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t re
 {
     submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "destroying session for reporter {}", reporterID);
-        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientDestroy);
+        utility::emitTraceCode(utility::ServiceTraceCode::ClientDestroy);
         if (reporterID == 0)
             return reply(turn, std::nullopt, true);
         if (const auto session = self.clientReportingSessionMap_.find(reporterID)) {
@@ -301,10 +301,10 @@ void KestoReportingClientServerInstance::logActiveSessions(KestoReportingService
 {
     const auto active = delegate.getAllActiveReportingSessions();
     KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
-              delegate.activeSessionCount(), KestoReportingDescriptionOfSessions(active));
+              delegate.activeSessionCount(), client::descriptionOfSessions(active));
 }
 
-std::string KestoReportingDescriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions)
+std::string client::descriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions)
 {
     constexpr std::size_t longest = std::size_t{24} << 10; // about what a line of the log shows
     std::vector<foundation::Value> descriptions;

@@ -6,10 +6,10 @@
 
 #include "client/KestoReportingServiceDelegateProtocol.h"
 #include "client/KestoReportingServiceProtocol.h"
-#include "client/KestoReportingSessionMap.h"
+#include "client/SessionMap.h"
 #include "foundation/Mutex.h"
-#include "session/KestoReportingStorageBudget.h"
-#include "utility/KestoReportingServerQueue.h"
+#include "session/StorageBudget.h"
+#include "utility/ServerQueue.h"
 
 #include <atomic>
 #include <cstdint>
@@ -46,10 +46,7 @@ public:
     [[nodiscard]] std::optional<std::string> clientProcessName() const;
     void setClientProcessName(std::optional<std::string> name);
 
-    [[nodiscard]] const KestoReportingSessionMap& clientReportingSessionMap() const
-    {
-        return clientReportingSessionMap_;
-    }
+    [[nodiscard]] const client::SessionMap& clientReportingSessionMap() const { return clientReportingSessionMap_; }
     // This client's session of that ID or, when asked to look further, that of any client.
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID,
                                                                                    bool acrossAllClients) const;
@@ -60,7 +57,7 @@ public:
     void setConfiguration(foundation::Dictionary configuration, std::int64_t reporterID, SuccessReply reply) override;
     void startReportingSessionForID(std::int64_t reporterID, SuccessReply reply) override;
     void sendMessage(foundation::Dictionary message, AudioEventCategory category, std::uint16_t type,
-                     std::optional<ReporterIDs> reporterIDs, KestoReportingReply reply) override;
+                     std::optional<ReporterIDs> reporterIDs, utility::Reply reply) override;
     void stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply) override;
     void destroyReportingSession(std::int64_t reporterID, SuccessReply reply) override;
     void reporterID(std::int64_t reporterID, DictionaryReply valid) override;
@@ -85,7 +82,7 @@ private:
     // Runs `work(*this, turn)` on the server queue, with this object kept alive.
     template <typename Work> void submit(Work work)
     {
-        KestoReportingServerQueue()->submit(
+        utility::serverQueue()->submit(
             [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
     }
     static void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
@@ -110,16 +107,19 @@ private:
     const std::int32_t processIdentifier_;
     std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);
     std::optional<std::string> clientProcessName_ KESTO_GUARDED_BY(registrationLock_);
-    KestoReportingSessionMap clientReportingSessionMap_;
+    client::SessionMap clientReportingSessionMap_;
     const std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate_;
 
-    std::shared_ptr<KestoReportingStorageBudget> budget_;
+    std::shared_ptr<session::StorageBudget> budget_;
     std::uint64_t sessionsRefused_ = 0;
     std::uint64_t receiversRefused_ = 0;
     std::atomic<bool> isConnectionLost_ = false;
     mutable foundation::Mutex registrationLock_;
 };
 
+namespace client {
+
 // The sessions' descriptions as one text for the log, as many as a line of it shows.
-[[nodiscard]] std::string
-KestoReportingDescriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions);
+[[nodiscard]] std::string descriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions);
+
+} // namespace client

@@ -10,15 +10,15 @@
 #include "sinks/KestoReportingFennicBridge.h"
 #include "sinks/KestoReportingGimboUtility.h"
 #include "sinks/KestoReportingTrelmBridge.h"
-#include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServiceTraceCodes.h"
 
 #include <algorithm>
 #include <span>
 
 void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary message, AudioEventCategory category,
                                                      std::uint16_t type, std::optional<ReporterIDs> reporterIDs,
-                                                     KestoReportingReply reply)
+                                                     utility::Reply reply)
 {
     // The sender is whoever makes this call, which need not be the process that this client was made for.
     const platform::Connection* caller = platform::Connection::current();
@@ -28,12 +28,12 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
             reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
                   reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
-        KestoReportingEmitTracePoint(KestoReportingTraceCode::ClientSendMessage);
+        utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
         const auto delegate = self.delegate_.lock();
         if (!delegate)
             return reply(turn, std::nullopt);
         if (!delegate->isReportingEnabled())
-            return reply(turn, KestoReportingErrorDisabled);
+            return reply(turn, utility::reportingDisabled);
         if (reporterIDs)
             self.deliverToReporters(turn, *delegate, message, *reporterIDs);
         else
@@ -69,7 +69,7 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn&
 {
     const auto active = delegate.getAllActiveReportingSessions();
     KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active.size(),
-              KestoReportingDescriptionOfSessions(active));
+              client::descriptionOfSessions(active));
     const std::size_t receivers = std::min(active.size(), mostReceivers(message, active.size()));
     countRefusedReceivers(active.size() - receivers);
     for (const auto& session : std::span(active).first(receivers)) {
@@ -107,7 +107,7 @@ void KestoReportingClientServerInstance::deliverStandalone(platform::Turn& turn,
     const auto session = std::make_shared<KestoReportingSession>(standaloneReporterID, ownProcess);
     session->setServiceType(AudioServiceTypeStandalone);
     session->updateConfigurationWithContentsOfConfiguration(
-        foundation::Dictionary{{KestoReportingHostApplicationKey, "Unknown"}});
+        foundation::Dictionary{{utility::hostApplicationKey, "Unknown"}});
     session->updateConfigurationWithContentsOfConfiguration(delegate.getDefaults());
     deliverToSinks(turn, delegate, message, session);
     deliverToSession(message, session);

@@ -32,7 +32,7 @@ public:
     // The session of that ID which belongs to the client registered first, or null.
     [[nodiscard]] virtual std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) = 0;
     // A sample of all audio drivers, by driver.
-    [[nodiscard]] virtual KestoReportingDriverSnapShot getSnapShot() = 0;
+    [[nodiscard]] virtual session::DriverSnapShot getSnapShot() = 0;
     // Reports to the session what the drivers did since its snapshot.
     virtual void sendDriverLogsForSession(platform::Turn& turn,
                                           const std::shared_ptr<KestoReportingSession>& session) = 0;

@@ -5,8 +5,8 @@
 #pragma once
 
 #include "foundation/values/Value.h"
-#include "utility/KestoReportingError.h"
-#include "utility/KestoReportingVocabulary.h"
+#include "utility/MessageKinds.h"
+#include "utility/Reply.h"
 
 #include <cstdint>
 #include <optional>
@@ -16,15 +16,15 @@
 // Called on a connection thread; replies are called on the server queue.
 class KestoReportingServiceProtocol {
 public:
-    using SuccessReply = KestoReportingResultReply<bool>;
-    using ServiceTypeReply = KestoReportingResultReply<AudioServiceType>;
-    using DictionaryReply = KestoReportingResultReply<const foundation::Dictionary&>;
-    using ArrayReply = KestoReportingResultReply<const foundation::Array&>;
+    using SuccessReply = utility::ResultReply<bool>;
+    using ServiceTypeReply = utility::ResultReply<AudioServiceType>;
+    using DictionaryReply = utility::ResultReply<const foundation::Dictionary&>;
+    using ArrayReply = utility::ResultReply<const foundation::Array&>;
     using ReporterIDs = std::vector<std::int64_t>;
 
     virtual ~KestoReportingServiceProtocol() = default;
 
-    // In the order of `KestoReportingOperations`.
+    // In the order of `client::serviceOperations`.
     virtual void createReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
     virtual void setServiceType(AudioServiceType serviceType, std::int64_t reporterID, SuccessReply reply) = 0;
     // Answers ID 0 twice: at once with 65535, and with what the look-up finds.
@@ -35,7 +35,7 @@ public:
     virtual void startReportingSessionForID(std::int64_t reporterID, SuccessReply reply) = 0;
     // No list means all started sessions of all clients.
     virtual void sendMessage(foundation::Dictionary message, AudioEventCategory category, std::uint16_t type,
-                             std::optional<ReporterIDs> reporterIDs, KestoReportingReply reply) = 0;
+                             std::optional<ReporterIDs> reporterIDs, utility::Reply reply) = 0;
     virtual void stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply) = 0;
     virtual void destroyReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
     // Answers {"reporterID", "serviceType"}: 0 and 65535 when there is no such session.
@@ -45,8 +45,10 @@ public:
     virtual void killService(SuccessReply reply) = 0;
 };
 
+namespace client {
+
 // In the same order.
-inline constexpr std::tuple KestoReportingServiceProtocolOperations{
+inline constexpr std::tuple serviceProtocolFunctions{
     &KestoReportingServiceProtocol::createReportingSession,
     &KestoReportingServiceProtocol::setServiceType,
     &KestoReportingServiceProtocol::getServiceNameForReporterID,
@@ -59,3 +61,5 @@ inline constexpr std::tuple KestoReportingServiceProtocolOperations{
     &KestoReportingServiceProtocol::getAllReporters,
     &KestoReportingServiceProtocol::killService,
 };
+
+} // namespace client

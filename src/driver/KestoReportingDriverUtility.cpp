@@ -2,8 +2,8 @@
 #include "driver/KestoReportingDriverUtility.h"
 
 #include "platform/Platform.h"
-#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
 
 namespace {
 
@@ -55,10 +55,10 @@ void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver)
     }
 }
 
-KestoReportingDriverSnapShot KestoReportingDriverUtility::getSnapShot() const
+session::DriverSnapShot KestoReportingDriverUtility::getSnapShot() const
 {
-    KestoReportingAssertServerQueue();
-    KestoReportingDriverSnapShot snapShot;
+    utility::assertServerQueue();
+    session::DriverSnapShot snapShot;
     for (const auto& [driver, subscription, channels] : ioChannelSubscriptions_) {
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "sampling driver {}", driver.description());
         auto sample = platform::current().reportingChannels.createSamples(*subscription, *channels);

@@ -4,7 +4,7 @@
 
 #include "driver/KestoReportingIOChannelSubscription.h"
 #include "foundation/values/Value.h"
-#include "session/KestoReportingDriverSnapShot.h"
+#include "session/DriverSnapShot.h"
 #include "session/KestoReportingSession.h"
 
 #include <memory>
@@ -27,7 +27,7 @@ public:
     }
 
     // A sample of every subscribed driver, by the driver's description. A sample that fails is left out.
-    [[nodiscard]] KestoReportingDriverSnapShot getSnapShot() const;
+    [[nodiscard]] session::DriverSnapShot getSnapShot() const;
 
     // Sends the session, and with the turn the analytics bridge, what changed since the session's snapshot: simple
     // values, histograms and states, each as one message, none where nothing changed.

@@ -4,8 +4,8 @@
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "sinks/KestoReportingFennicBridge.h"
-#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
 
 #include <algorithm>
 #include <iterator>
@@ -39,7 +39,7 @@ void processChannel(const platform::ReportingChannel& channel, DriverStatsByForm
 }
 
 // How the driver's channels changed since the snapshot; on failure it logs the error and returns nothing.
-std::optional<platform::ReportingSample> differenceSince(const KestoReportingDriverSnapShot& snapShot,
+std::optional<platform::ReportingSample> differenceSince(const session::DriverSnapShot& snapShot,
                                                          const std::string& driver,
                                                          const platform::ReportingSample& sample)
 {
@@ -86,7 +86,7 @@ void appendComponent(const std::optional<std::string>& component, std::string& k
 void KestoReportingDriverUtility::sendDriverLogsForSession(platform::Turn& turn,
                                                            const std::shared_ptr<KestoReportingSession>& session) const
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     DriverStatsByFormat stats;
     for (const auto& [driver, subscription, channels] : ioChannelSubscriptions_) {
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "getting latest samples");

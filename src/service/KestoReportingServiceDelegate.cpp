@@ -3,8 +3,8 @@
 
 #include "client/KestoReportingClientServerInstance.h"
 #include "platform/Platform.h"
-#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
 
 namespace {
 constexpr std::string_view preferencesDomain = "com.quarn.kesto";
@@ -14,7 +14,7 @@ constexpr std::string_view disableReportingKey = "disable_reporting";
 
 std::shared_ptr<KestoReportingServiceDelegate> KestoReportingServiceDelegate::make()
 {
-    KestoReportingCreateServerQueue();
+    utility::createServerQueue();
     std::shared_ptr<KestoReportingServiceDelegate> service(new KestoReportingServiceDelegate);
     service->listenForFeatureStateChanges();
     service->driverUtility_ = std::make_unique<KestoReportingDriverUtility>();
@@ -61,14 +61,14 @@ void KestoReportingServiceDelegate::handleEventForVorp(const foundation::Diction
                                                        const std::shared_ptr<KestoReportingSession>& session,
                                                        const std::string& processName)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     if (KestoReportingUtilityIsInternalBuild())
         vorpStateManager_->handleEvent(message, category, type, session, processName);
 }
 
 void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     clients_.push_back(client);
     {
         const foundation::Lock lock(lock_);
@@ -81,7 +81,7 @@ void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoRe
 
 void KestoReportingServiceDelegate::removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     {
         const foundation::Lock lock(lock_);
         reporterIndex_.unregisterClient(*client);
@@ -92,7 +92,7 @@ void KestoReportingServiceDelegate::removeClient(const std::shared_ptr<KestoRepo
 void KestoReportingServiceDelegate::reporterIDAdded(std::int64_t reporterID,
                                                     const KestoReportingClientServerInstance& client)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     const foundation::Lock lock(lock_);
     reporterIndex_.add(reporterID, client);
 }
@@ -100,21 +100,21 @@ void KestoReportingServiceDelegate::reporterIDAdded(std::int64_t reporterID,
 void KestoReportingServiceDelegate::reporterIDRemoved(std::int64_t reporterID,
                                                       const KestoReportingClientServerInstance& client)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     const foundation::Lock lock(lock_);
     reporterIndex_.remove(reporterID, client);
 }
 
 KestoReportingServiceDelegateProtocol::Sessions KestoReportingServiceDelegate::getAllActiveReportingSessions()
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     Sessions active;
     for (const auto& client : getAllClients()) {
         Sessions sessions;
         for (const auto& entry : client->clientReportingSessionMap())
             sessions.push_back(entry.session);
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "sessions for client {} : {}",
-                  client->processIdentifier(), KestoReportingDescriptionOfSessions(sessions));
+                  client->processIdentifier(), client::descriptionOfSessions(sessions));
         std::erase_if(sessions, [](const auto& session) { return !session->started(); });
         active.insert(active.end(), sessions.begin(), sessions.end());
     }
@@ -123,7 +123,7 @@ KestoReportingServiceDelegateProtocol::Sessions KestoReportingServiceDelegate::g
 
 std::shared_ptr<KestoReportingSession> KestoReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     const foundation::Lock lock(lock_);
     if (reporterID == 0 || !reportingEnabled_)
         return nullptr;

@@ -8,7 +8,7 @@
 #include "driver/KestoReportingDriverUtility.h"
 #include "foundation/Mutex.h"
 #include "platform/Connection.h"
-#include "service/KestoReportingReporterIndex.h"
+#include "service/ReporterIndex.h"
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 
 #include <array>
@@ -45,7 +45,7 @@ public:
     [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
     [[nodiscard]] Sessions getAllActiveReportingSessions() override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
-    [[nodiscard]] KestoReportingDriverSnapShot getSnapShot() override { return driverUtility_->getSnapShot(); }
+    [[nodiscard]] session::DriverSnapShot getSnapShot() override { return driverUtility_->getSnapShot(); }
     void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) override
     {
         driverUtility_->sendDriverLogsForSession(turn, session);
@@ -89,7 +89,7 @@ private:
     std::unique_ptr<KestoReportingUtilityVorpStateManager> vorpStateManager_; // on internal builds only
 
     foundation::Mutex lock_;
-    KestoReportingReporterIndex reporterIndex_ KESTO_GUARDED_BY(lock_);
+    service::ReporterIndex reporterIndex_ KESTO_GUARDED_BY(lock_);
 
     mutable foundation::Mutex featuresLock_;
     Features features_ KESTO_GUARDED_BY(featuresLock_);

@@ -1,11 +1,11 @@
 // A connection's beginning and end: the service makes and registers the client object; when the peer has gone, it stops
 // the client's sessions and sends an event with the time that the client was connected.
 #include "client/KestoReportingClientServerInstance.h"
-#include "client/KestoReportingServiceProtocolAdapter.h"
+#include "client/ServiceProtocolAdapter.h"
 #include "platform/Platform.h"
 #include "service/KestoReportingServiceDelegate.h"
-#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
 
 #include <cmath>
 
@@ -22,11 +22,11 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
         const auto client = std::make_shared<Client>(processIdentifier, weak_from_this());
         weakClient = client;
         connection->setCallHandler(
-            [adapter = KestoReportingServiceProtocolAdapter(client)](platform::Connection::Call call) mutable {
+            [adapter = client::ServiceProtocolAdapter(client)](platform::Connection::Call call) mutable {
                 return adapter.handleCall(std::move(call));
             });
     }
-    KestoReportingServerQueue()->submit([self = shared_from_this(), weakClient] {
+    utility::serverQueue()->submit([self = shared_from_this(), weakClient] {
         if (const auto client = weakClient.lock())
             self->registerClient(client);
     });

@@ -3,8 +3,8 @@
 #include "client/KestoReportingClientServerInstance.h"
 #include "platform/Platform.h"
 #include "service/KestoReportingServiceDelegate.h"
-#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
 
 #include <cmath>
 
@@ -15,7 +15,7 @@ void KestoReportingServiceDelegate::listenForFeatureStateChanges()
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "listening for features {}", descriptionOf(table));
     for (std::size_t place = 0; place < table.size(); ++place) {
         const auto [status, token] = platform::current().notifications.registerNotification(
-            table[place].notification, KestoReportingServerQueue(), [service = weak_from_this()](std::int32_t changed) {
+            table[place].notification, utility::serverQueue(), [service = weak_from_this()](std::int32_t changed) {
                 if (const auto self = service.lock())
                     self->handleFeatureChange(changed);
             });
@@ -35,7 +35,7 @@ KestoReportingServiceDelegate::Features KestoReportingServiceDelegate::features(
 
 std::optional<foundation::Dictionary> KestoReportingServiceDelegate::getFeaturesState()
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "getting features");
     foundation::Dictionary::Entries state;
     const Features table = features();
@@ -45,7 +45,7 @@ std::optional<foundation::Dictionary> KestoReportingServiceDelegate::getFeatures
     if (state.empty())
         return std::nullopt;
     const platform::Clock& clock = platform::current().clock;
-    state.push_back({KestoReportingTimestampKey, clock.secondsSince1970()});
+    state.push_back({utility::timestampKey, clock.secondsSince1970()});
     state.push_back({"systemuptime_sec", static_cast<std::int32_t>(std::lround(clock.systemUptime()))});
     return state;
 }
@@ -64,7 +64,7 @@ std::optional<foundation::Value> KestoReportingServiceDelegate::valueOf(const Fe
 
 void KestoReportingServiceDelegate::handleFeatureChange(std::int32_t token)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "feature {} changes", token);
     const auto state = getFeaturesState();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "defaults {}",

@@ -2,12 +2,12 @@
 // that the description does not delay the requesting thread.
 #include "client/KestoReportingClientServerInstance.h"
 #include "service/KestoReportingServiceDelegate.h"
-#include "utility/KestoReportingServerQueue.h"
-#include "utility/KestoReportingVocabulary.h"
+#include "utility/MessageKinds.h"
+#include "utility/ServerQueue.h"
 
 foundation::Value KestoReportingServiceDelegate::stateForBugCapture() const
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     constexpr std::size_t mostShown = 200;
     std::size_t count = 0;
     std::vector<foundation::Value> shown;

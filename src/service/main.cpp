@@ -6,7 +6,7 @@
 #include "platform/linux/process/ServiceManager.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "tracing/TraceRunner.h"
-#include "utility/KestoReportingLogCategories.h"
+#include "utility/LogCategories.h"
 
 #include <csignal>
 #include <cstdio>

@@ -7,9 +7,9 @@
 #include "sinks/KestoReportingFennicBridge.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"
-#include "utility/KestoReportingServerQueue.h"
-#include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
+#include "utility/ServiceTraceCodes.h"
 
 #include <utility>
 
@@ -24,7 +24,7 @@ std::string applicationText(const foundation::Dictionary& configuration)
 }
 
 // What a snapshot takes, roughly.
-std::size_t roughBytes(const KestoReportingDriverSnapShot& snapShot)
+std::size_t roughBytes(const session::DriverSnapShot& snapShot)
 {
     std::size_t bytes = 0;
     for (const auto& [driver, sample] : snapShot)
@@ -41,7 +41,7 @@ std::size_t roughBytes(const KestoReportingDriverSnapShot& snapShot)
 } // namespace
 
 KestoReportingSession::KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
-                                             std::shared_ptr<KestoReportingStorageBudget> budget)
+                                             std::shared_ptr<session::StorageBudget> budget)
     : applicationText_(applicationText({})),
       reporterID_(reporterID),
       processIdentifiers_(std::move(processIdentifiers)),
@@ -50,12 +50,12 @@ KestoReportingSession::KestoReportingSession(std::int64_t reporterID, std::vecto
       driverSnapShotShare_(budget_)
 {
     KESTO_LOG(KestoReportingSessionCategory(), Info, "created reporting session for ID: {}", reporterID_);
-    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionCreated);
+    utility::emitTraceCode(utility::ServiceTraceCode::SessionCreated);
 }
 
 KestoReportingSession::~KestoReportingSession()
 {
-    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionDestroyed);
+    utility::emitTraceCode(utility::ServiceTraceCode::SessionDestroyed);
     KESTO_LOG(KestoReportingSessionCategory(), Info, "deallocing this session {}", reporterID_);
     letGoOfMessages();
 }
@@ -106,13 +106,13 @@ void KestoReportingSession::updateConfigurationWithContentsOfConfiguration(
         return;
     }
     configuration_ = std::move(merged);
-    if (configuration->contains(KestoReportingHostApplicationKey))
+    if (configuration->contains(utility::hostApplicationKey))
         applicationText_ = applicationText(configuration_);
 }
 
-void KestoReportingSession::setDriverSnapShot(std::optional<KestoReportingDriverSnapShot> snapShot)
+void KestoReportingSession::setDriverSnapShot(std::optional<session::DriverSnapShot> snapShot)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     if (!driverSnapShotShare_.resize(snapShot ? roughBytes(*snapShot) : 0)) {
         KESTO_LOG(KestoReportingSessionCategory(), Error,
                   "no memory left for the drivers' snapshot of session {}; its driver statistics are lost",
@@ -125,7 +125,7 @@ void KestoReportingSession::setDriverSnapShot(std::optional<KestoReportingDriver
 
 void KestoReportingSession::start()
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "starting session owned by {}", reporterID_);
     if (started_) {
         KESTO_LOG(KestoReportingSessionCategory(), Info, "{} is already started", reporterID_);
@@ -135,20 +135,20 @@ void KestoReportingSession::start()
     messagesLost_ = 0;
     {
         const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        nestedAggregatedPayloadData_ = std::make_shared<KestoReportingMessageStore>(budget_);
+        nestedAggregatedPayloadData_ = std::make_shared<session::MessageStore>(budget_);
     }
-    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStarted);
+    utility::emitTraceCode(utility::ServiceTraceCode::SessionStarted);
     startTracing();
 }
 
 void KestoReportingSession::stop(platform::Turn& turn)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     if (!started_)
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
-    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionStopping);
+    utility::emitTraceCode(utility::ServiceTraceCode::SessionStopping);
     sendVolumeEvents(turn);
     writeSummaryJson();
     sendSummaryEvent();
@@ -172,7 +172,7 @@ void KestoReportingSession::letGoOfMessages()
 
 // To be read without its lock, which would keep recorders waiting for a disk: whoever stops the session is the one who
 // records, so nothing is recorded meanwhile.
-std::shared_ptr<const KestoReportingMessageStore> KestoReportingSession::store() const
+std::shared_ptr<const session::MessageStore> KestoReportingSession::store() const
 {
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
     return nestedAggregatedPayloadData_;
@@ -183,7 +183,7 @@ void KestoReportingSession::sendVolumeEvents(platform::Turn& turn)
     const auto application = KestoReportingUtilityRetrieveAppName(configuration());
     const auto process = application.isNull() ? std::nullopt : std::optional(application);
     const double minimumPlaytime = KestoReportingUtilityVolumeMinimumPlayingTime(serviceType_);
-    KestoReportingStorageShare share(budget_);
+    session::StorageShare share(budget_);
     auto volumeEvents = createVolumeMessages(*store(), process, minimumPlaytime, share);
     if (volumeEvents.empty())
         return;

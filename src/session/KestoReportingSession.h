@@ -7,10 +7,10 @@
 
 #include "foundation/Mutex.h"
 #include "foundation/values/Value.h"
-#include "session/KestoReportingDriverSnapShot.h"
-#include "session/KestoReportingMessageStore.h"
-#include "sinks/KestoReportingSinkSession.h"
-#include "utility/KestoReportingError.h"
+#include "session/DriverSnapShot.h"
+#include "session/MessageStore.h"
+#include "sinks/SinkSession.h"
+#include "utility/Reply.h"
 
 #include <atomic>
 #include <cstdint>
@@ -31,13 +31,13 @@ extern const foundation::String KestoReportingTraceTypeKtrace;
 
 // Owned by a shared pointer. Driven from the server queue, on which all that its client instance keeps in it is read
 // and written. What sinks read (service type, configuration) may be read from any thread, and so may what it recorded.
-class KestoReportingSession final : public KestoReportingSinkSession,
+class KestoReportingSession final : public sinks::SinkSession,
                                     public std::enable_shared_from_this<KestoReportingSession> {
 public:
     // The identity never changes. The first process is the session's owner. What the session keeps for its client is
     // paid from the budget.
     KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
-                          std::shared_ptr<KestoReportingStorageBudget> budget = KestoReportingStorageBudget::service());
+                          std::shared_ptr<session::StorageBudget> budget = session::StorageBudget::service());
     ~KestoReportingSession() override;
     KestoReportingSession(const KestoReportingSession&) = delete;
     KestoReportingSession& operator=(const KestoReportingSession&) = delete;
@@ -83,7 +83,7 @@ public:
     [[nodiscard]] const TraceParams* traceParams() const { return traceParams_.get(); }
 
     // Called before the message's function returns, if at all.
-    using MessageReply = std::function<void(const std::optional<KestoReportingError>& error)>;
+    using MessageReply = std::function<void(const std::optional<utility::ReplyError>& error)>;
     // Normalises and records the message, then calls the reply, if there is one, with no error. `sync` makes no
     // difference: the message is always handled at once on the caller's thread. No message is an empty one.
     void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
@@ -104,15 +104,15 @@ public:
     // definition; the volume analysis folds only the entries that it reads. The properties `RapidMessages` and
     // `VolumeMessagesOfAnyStore` bind both to one description of it.
     [[nodiscard]] static std::vector<foundation::Dictionary>
-    combineRapidMessages(const KestoReportingMessageStore& messages, std::span<const std::string_view> keysToCombine,
+    combineRapidMessages(const session::MessageStore& messages, std::span<const std::string_view> keysToCombine,
                          double maximumPausetime);
     // One event for each stretch of more than so many seconds during which output ran unchanged. Without a process
     // there are none. The share, which is empty, pays for them from now on, but for the first `unpaidVolumeEventBytes`.
     // Events that would take more than `mostVolumeEventBytes` together, or more than the budget has, are lost, with a
     // log line.
     [[nodiscard]] static std::vector<foundation::Dictionary>
-    createVolumeMessages(const KestoReportingMessageStore& messages, const std::optional<foundation::Value>& process,
-                         double minimumPlaytime, KestoReportingStorageShare& share);
+    createVolumeMessages(const session::MessageStore& messages, const std::optional<foundation::Value>& process,
+                         double minimumPlaytime, session::StorageShare& share);
     static constexpr std::size_t mostVolumeEventBytes = std::size_t{64} << 20;
     // One session ends at a time, so that a few events take nothing from anybody: a client that has used up its budget
     // still learns what was played.
@@ -129,19 +129,16 @@ public:
     void writeSummaryJson() const;
 
     // The reply of the call that started this run, kept by the client instance until its work is done.
-    [[nodiscard]] const KestoReportingResultReply<bool>& transactionCompleteBlock() const
+    [[nodiscard]] const utility::ResultReply<bool>& transactionCompleteBlock() const
     {
         return transactionCompleteBlock_;
     }
-    void setTransactionCompleteBlock(KestoReportingResultReply<bool> block)
-    {
-        transactionCompleteBlock_ = std::move(block);
-    }
+    void setTransactionCompleteBlock(utility::ResultReply<bool> block) { transactionCompleteBlock_ = std::move(block); }
 
     // What the drivers' channels held when the session started; set and cleared by the client instance. One that the
     // budget has no room for is not kept, with a log line.
-    [[nodiscard]] const std::optional<KestoReportingDriverSnapShot>& driverSnapShot() const { return driverSnapShot_; }
-    void setDriverSnapShot(std::optional<KestoReportingDriverSnapShot> snapShot);
+    [[nodiscard]] const std::optional<session::DriverSnapShot>& driverSnapShot() const { return driverSnapShot_; }
+    void setDriverSnapShot(std::optional<session::DriverSnapShot> snapShot);
 
     // Asked for by the client; kept for it and never read here.
     [[nodiscard]] bool blinReportingEnabled() const { return blinReportingEnabled_; }
@@ -158,7 +155,7 @@ public:
     [[nodiscard]] static bool shouldReportOrientation() { return false; }
 
 private:
-    [[nodiscard]] std::shared_ptr<const KestoReportingMessageStore> store() const;
+    [[nodiscard]] std::shared_ptr<const session::MessageStore> store() const;
     [[nodiscard]] std::string summaryFileName() const;
     void sendVolumeEvents(platform::Turn& turn);
     void sendSummaryEvent();
@@ -172,20 +169,20 @@ private:
     std::atomic<AudioServiceType> serviceType_{0};
     foundation::Dictionary configuration_ KESTO_GUARDED_BY(configurationLock_);
     std::string applicationText_ KESTO_GUARDED_BY(configurationLock_); // the host application's name, for the log
-    std::optional<KestoReportingDriverSnapShot> driverSnapShot_;
-    KestoReportingResultReply<bool> transactionCompleteBlock_;
+    std::optional<session::DriverSnapShot> driverSnapShot_;
+    utility::ResultReply<bool> transactionCompleteBlock_;
     const std::int64_t reporterID_;
     const std::vector<std::int32_t> processIdentifiers_;
-    std::shared_ptr<KestoReportingMessageStore>
+    std::shared_ptr<session::MessageStore>
         nestedAggregatedPayloadData_ KESTO_GUARDED_BY(nestedAggregatedPayloadDataLock_);
     std::string_view serviceName_;
     std::optional<std::string> tracingFileName_;
     std::unique_ptr<TraceParams> traceParams_;
     std::unique_ptr<TraceRunner> traceRunner_;
 
-    const std::shared_ptr<KestoReportingStorageBudget> budget_;
-    KestoReportingStorageShare configurationShare_ KESTO_GUARDED_BY(configurationLock_);
-    KestoReportingStorageShare driverSnapShotShare_;
+    const std::shared_ptr<session::StorageBudget> budget_;
+    session::StorageShare configurationShare_ KESTO_GUARDED_BY(configurationLock_);
+    session::StorageShare driverSnapShotShare_;
     mutable std::uint64_t messagesLost_ = 0; // in this run, for want of memory
     mutable foundation::Mutex configurationLock_;
     mutable foundation::Mutex nestedAggregatedPayloadDataLock_;

@@ -2,9 +2,9 @@
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
-#include "utility/KestoReportingServerQueue.h"
-#include "utility/KestoReportingTraceCodes.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
+#include "utility/ServiceTraceCodes.h"
 
 #include <chrono>
 #include <random>
@@ -13,12 +13,11 @@ void KestoReportingSession::sendMessage(const std::optional<foundation::Dictiona
                                         AudioEventCategory category, AudioEventType type, [[maybe_unused]] bool sync,
                                         const MessageReply& reply)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending message for session owned by {}", reporterID_);
-    createMessageIdentifier(
-        category, type,
-        KestoReportingUtilityNormaliseMessage(message.value_or(foundation::Dictionary()), category, type));
-    KestoReportingEmitTracePoint(KestoReportingTraceCode::SessionMessageAccepted);
+    createMessageIdentifier(category, type,
+                            utility::normaliseMessage(message.value_or(foundation::Dictionary()), category, type));
+    utility::emitTraceCode(utility::ServiceTraceCode::SessionMessageAccepted);
     if (reply)
         reply(std::nullopt);
 }
@@ -36,11 +35,11 @@ bool KestoReportingSession::createMessageIdentifier(AudioEventCategory category,
     if (!nestedAggregatedPayloadData_)
         return false;
     switch (nestedAggregatedPayloadData_->record(category, type, message)) {
-    case KestoReportingMessageStore::Outcome::Recorded: return false;
-    case KestoReportingMessageStore::Outcome::Redundant:
+    case session::MessageStore::Outcome::Recorded: return false;
+    case session::MessageStore::Outcome::Redundant:
         KESTO_LOG(KestoReportingSessionCategory(), Debug, "dropping redundant event");
         return true;
-    case KestoReportingMessageStore::Outcome::Full: break;
+    case session::MessageStore::Outcome::Full: break;
     }
     if (messagesLost_++ == 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error,
@@ -68,9 +67,9 @@ std::optional<std::vector<foundation::Dictionary>> KestoReportingSession::nested
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
     if (!nestedAggregatedPayloadData_)
         return std::nullopt;
-    const KestoReportingMessageStore& store = *nestedAggregatedPayloadData_;
+    const session::MessageStore& store = *nestedAggregatedPayloadData_;
     std::vector<foundation::Dictionary> messages;
-    store.forEach([&](const KestoReportingMessageStore::Message& message) {
+    store.forEach([&](const session::MessageStore::Message& message) {
         messages.push_back({{foundation::String(store.identifier(message)), message.payload.dictionary()}});
     });
     return messages;

@@ -7,7 +7,7 @@
 #include "foundation/text/PrettyJsonWriter.h"
 #include "foundation/text/StringBuilder.h"
 #include "platform/Platform.h"
-#include "session/KestoReportingEntryReader.h"
+#include "session/EntryReader.h"
 #include "session/KestoReportingSession.h"
 #include "utility/KestoReportingUtility.h"
 
@@ -29,7 +29,7 @@ constexpr unsigned summaryDirectoryPermissions = 0777;
 // take in the store: what is gathered is paid from the budget while it is.
 class ValuesByKey {
 public:
-    explicit ValuesByKey(std::shared_ptr<KestoReportingStorageBudget> budget) : share_(std::move(budget)) { }
+    explicit ValuesByKey(std::shared_ptr<session::StorageBudget> budget) : share_(std::move(budget)) { }
 
     // Which of the texts is the key's. Keys come in the same order in nearly every message: the one behind the last
     // is tried first. A sorted index otherwise: no choice of keys makes it slow.
@@ -123,7 +123,7 @@ private:
     std::map<std::string_view, std::size_t>
         positions_; // the keys are those of `values_`, whose characters stay in place
     std::size_t last_ = 0; // the position of the value that came last
-    KestoReportingStorageShare share_;
+    session::StorageShare share_;
     std::size_t used_ = 0;
     bool isOutOfMemory_ = false;
 };
@@ -173,12 +173,12 @@ void writeEntry(foundation::PrettyJsonWriter& writer, WrittenEntry& entry, found
 }
 
 // An array of one-entry objects, identifier to payload. False when the store holds what JSON cannot say.
-bool writeJson(const KestoReportingMessageStore& store, foundation::PrettyJsonWriter::Sink sink)
+bool writeJson(const session::MessageStore& store, foundation::PrettyJsonWriter::Sink sink)
 {
     foundation::PrettyJsonWriter writer(std::move(sink));
-    KestoReportingEntryReader<WrittenEntry> entries;
+    session::EntryReader<WrittenEntry> entries;
     writer.beginArray();
-    store.forEach([&](const KestoReportingMessageStore::Message& message) {
+    store.forEach([&](const session::MessageStore::Message& message) {
         writer.beginObject();
         writer.key(store.identifier(message));
         writer.beginObject();
@@ -203,8 +203,8 @@ std::optional<Dictionary> KestoReportingSession::createSummaryEventForSession() 
     foundation::appendCbor(foundation::Value(serviceType_.load()), serviceType);
     ValuesByKey values(budget_);
     values.append(values.positionOf(summaryKey), foundation::CborItem(serviceType));
-    KestoReportingEntryReader<std::size_t> entries;
-    KestoReportingMessageStore::Cursor cursor(*nestedAggregatedPayloadData_);
+    session::EntryReader<std::size_t> entries;
+    session::MessageStore::Cursor cursor(*nestedAggregatedPayloadData_);
     while (!values.isOutOfMemory() && cursor.next())
         entries.read(
             cursor.kind(), cursor.payload(), [&](std::string_view key) { return values.positionOf(key); },

@@ -3,9 +3,9 @@
 //
 // The switches of spatial audio arrive in bursts, which are folded into one payload first.
 #define KESTO_LOG_NAME "KestoReportingSession"
-#include "session/KestoReportingRapidMessages.h"
 #include "session/KestoReportingSession.h"
-#include "session/KestoReportingVolumeFields.h"
+#include "session/RapidMessages.h"
+#include "session/VolumeFields.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <algorithm>
@@ -16,8 +16,8 @@ namespace {
 
 using foundation::Dictionary;
 using foundation::Value;
-using Fields = KestoReportingVolumeFields;
-using Key = KestoReportingVolumeKey;
+using Fields = session::VolumeFields;
+using Key = session::VolumeKey;
 
 constexpr std::string_view functionName = "+[KestoReportingSession createVolumeMessages:process:minimumPlaytime:]";
 constexpr double longestPause = 2.0; // seconds, within a burst
@@ -31,16 +31,16 @@ constexpr std::array keysOfAnEvent{
 const foundation::Reference<foundation::DictionaryShape>& shapeOfEvents()
 {
     static const auto shape = foundation::DictionaryShape::make({
-        KestoReportingVolumeKeyName(Key::SelectedFormat),
-        KestoReportingVolumeKeyName(Key::ActiveDevices),
-        KestoReportingHostApplicationKey,
-        KestoReportingVolumeKeyName(Key::Volume),
+        session::volumeKeyName(Key::SelectedFormat),
+        session::volumeKeyName(Key::ActiveDevices),
+        utility::hostApplicationKey,
+        session::volumeKeyName(Key::Volume),
         "PomoSessionVolumeBucketed",
         "play_seconds",
-        KestoReportingVolumeKeyName(Key::SpatialAudioAccessoryFeature),
-        KestoReportingVolumeKeyName(Key::SpatializationEnabled),
-        KestoReportingVolumeKeyName(Key::RingerState),
-        KestoReportingVolumeKeyName(Key::ChannelsPerFrame),
+        session::volumeKeyName(Key::SpatialAudioAccessoryFeature),
+        session::volumeKeyName(Key::SpatializationEnabled),
+        session::volumeKeyName(Key::RingerState),
+        session::volumeKeyName(Key::ChannelsPerFrame),
         "play_secondsBucketed",
         "msgidx",
         "msgcnt",
@@ -53,9 +53,9 @@ using ValuesOfEvent = std::array<Value, 13>;
 
 // What folding bursts needs to know of the payloads as the analysis sees them.
 struct VolumePayloads {
-    KestoReportingVolumeFieldsReader reader;
+    session::VolumeFieldsReader reader;
 
-    Fields read(const KestoReportingMessageStore::Cursor& message) { return reader.read(message); }
+    Fields read(const session::MessageStore::Cursor& message) { return reader.read(message); }
     static bool isCombinable(const Fields& payload)
     {
         return payload.has(Key::SpatialAudioAccessoryFeature) || payload.has(Key::SpatializationEnabled);
@@ -71,14 +71,14 @@ struct VolumePayloads {
 struct WholePayloads {
     std::span<const std::string_view> keysToCombine;
 
-    static Dictionary read(const KestoReportingMessageStore::Cursor& message) { return message.payload().dictionary(); }
+    static Dictionary read(const session::MessageStore::Cursor& message) { return message.payload().dictionary(); }
     [[nodiscard]] bool isCombinable(const Dictionary& payload) const
     {
         return std::ranges::any_of(keysToCombine, [&](std::string_view key) { return payload.contains(key); });
     }
     static std::optional<double> timeOf(const Dictionary& payload)
     {
-        const Value* time = payload.find(KestoReportingTimestampKey);
+        const Value* time = payload.find(utility::timestampKey);
         return time == nullptr ? std::nullopt : std::optional(time->asDouble());
     }
     static void merge(Dictionary& into, const Dictionary& payload) { into = into.mergedWith(payload); }
@@ -87,7 +87,7 @@ struct WholePayloads {
 // Replays payloads and gathers the events of the stretches that end.
 class VolumeAnalysis {
 public:
-    VolumeAnalysis(const std::optional<Value>& process, double minimumPlaytime, KestoReportingStorageShare& share)
+    VolumeAnalysis(const std::optional<Value>& process, double minimumPlaytime, session::StorageShare& share)
         : process_(process),
           minimumPlaytime_(minimumPlaytime),
           share_(share)
@@ -267,8 +267,8 @@ private:
 
     const std::optional<Value>& process_;
     const double minimumPlaytime_;
-    KestoReportingStorageShare& share_;
-    KestoReportingVolumeFieldsReader constants_;
+    session::StorageShare& share_;
+    session::VolumeFieldsReader constants_;
     Fields state_;
     std::array<std::optional<Unpacked>, static_cast<std::size_t>(Key::Count)> stateValues_; // those that were asked for
     bool stateIsRunning_ = false;
@@ -282,27 +282,27 @@ private:
 
 } // namespace
 
-std::vector<Dictionary> KestoReportingSession::combineRapidMessages(const KestoReportingMessageStore& messages,
+std::vector<Dictionary> KestoReportingSession::combineRapidMessages(const session::MessageStore& messages,
                                                                     std::span<const std::string_view> keysToCombine,
                                                                     double maximumPausetime)
 {
     std::vector<Dictionary> combined;
     WholePayloads payloads{keysToCombine};
-    KestoReportingCombineRapidMessages(messages, maximumPausetime, payloads,
-                                       [&](const Dictionary& payload) { combined.push_back(payload); });
+    session::combineRapidMessages(messages, maximumPausetime, payloads,
+                                  [&](const Dictionary& payload) { combined.push_back(payload); });
     return combined;
 }
 
-std::vector<Dictionary> KestoReportingSession::createVolumeMessages(const KestoReportingMessageStore& messages,
+std::vector<Dictionary> KestoReportingSession::createVolumeMessages(const session::MessageStore& messages,
                                                                     const std::optional<Value>& process,
                                                                     double minimumPlaytime,
-                                                                    KestoReportingStorageShare& share)
+                                                                    session::StorageShare& share)
 {
     KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Debug, "entering createVolumeMessages {}", functionName);
     VolumePayloads payloads;
     VolumeAnalysis analysis(process, minimumPlaytime, share);
-    KestoReportingCombineRapidMessages(messages, longestPause, payloads,
-                                       [&](const Fields& payload) { analysis.process(payload); });
+    session::combineRapidMessages(messages, longestPause, payloads,
+                                  [&](const Fields& payload) { analysis.process(payload); });
     auto events = std::move(analysis).finish();
     KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Debug,
               "returning volume message {{ func={}, action=return, count={} }}", functionName, events.size());

@@ -3,8 +3,8 @@
 
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
-#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
 
 #include <array>
 #include <mutex>
@@ -15,7 +15,7 @@ namespace {
 
 class LazyPayload {
 public:
-    LazyPayload(foundation::Dictionary message, std::shared_ptr<const KestoReportingSinkSession> session)
+    LazyPayload(foundation::Dictionary message, std::shared_ptr<const sinks::SinkSession> session)
         : message_(std::move(message)),
           session_(std::move(session))
     {
@@ -25,8 +25,8 @@ public:
     foundation::Dictionary build()
     {
         std::call_once(built_, [this] {
-            if (!message_.contains(KestoReportingHostApplicationKey))
-                message_ = message_.with(KestoReportingHostApplicationKey,
+            if (!message_.contains(utility::hostApplicationKey))
+                message_ = message_.with(utility::hostApplicationKey,
                                          KestoReportingUtilityRetrieveAppName(session_->configuration()));
         });
         return message_;
@@ -35,7 +35,7 @@ public:
 private:
     std::once_flag built_;
     foundation::Dictionary message_;
-    const std::shared_ptr<const KestoReportingSinkSession> session_;
+    const std::shared_ptr<const sinks::SinkSession> session_;
 };
 
 // The names of a message's two events.
@@ -72,9 +72,9 @@ const EventNames& eventNames(AudioEventCategory category, AudioEventType type, A
 
 void KestoReportingFennicBridge::handleEvent(platform::Turn& turn, const foundation::Dictionary& message,
                                              AudioEventCategory category, AudioEventType type,
-                                             const std::shared_ptr<const KestoReportingSinkSession>& session)
+                                             const std::shared_ptr<const sinks::SinkSession>& session)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     platform::Analytics& analytics = platform::current().analytics;
     std::shared_ptr<LazyPayload> payload;
     const auto offer = [&](const std::string& eventName) {

@@ -5,7 +5,7 @@
 #pragma once
 
 #include "platform/Turn.h"
-#include "sinks/KestoReportingSinkSession.h"
+#include "sinks/SinkSession.h"
 
 #include <memory>
 
@@ -15,5 +15,5 @@ public:
     // Sends with the turn "com.quarn.kesto.<category>.<type>" and "com.quarn.<service>.<category>.<type>", in this
     // order. The payload is the message as it came, with the session's host application added where it names none.
     static void handleEvent(platform::Turn& turn, const foundation::Dictionary& message, AudioEventCategory category,
-                            AudioEventType type, const std::shared_ptr<const KestoReportingSinkSession>& session);
+                            AudioEventType type, const std::shared_ptr<const sinks::SinkSession>& session);
 };

@@ -2,7 +2,7 @@
 // added without a change in the path of a message.
 #pragma once
 
-#include "sinks/KestoReportingSinkSession.h"
+#include "sinks/SinkSession.h"
 
 #include <memory>
 
@@ -10,8 +10,7 @@
 class KestoReportingGimboUtility {
 public:
     static void handleEvent(const foundation::Dictionary& /*message*/, AudioEventCategory /*category*/,
-                            AudioEventType /*type*/,
-                            const std::shared_ptr<const KestoReportingSinkSession>& /*session*/)
+                            AudioEventType /*type*/, const std::shared_ptr<const sinks::SinkSession>& /*session*/)
     {
     }
 };

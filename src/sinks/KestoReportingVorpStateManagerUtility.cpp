@@ -3,8 +3,8 @@
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 
 #include "platform/Platform.h"
-#include "utility/KestoReportingServerQueue.h"
 #include "utility/KestoReportingUtility.h"
+#include "utility/ServerQueue.h"
 
 namespace {
 constexpr AudioEventType typeGimbo = 8;
@@ -19,10 +19,10 @@ bool isRepeat(const foundation::Dictionary& message, const foundation::Dictionar
 
 void KestoReportingUtilityVorpStateManager::handleEvent(const std::optional<foundation::Dictionary>& message,
                                                         AudioEventCategory category, AudioEventType type,
-                                                        const std::shared_ptr<const KestoReportingSinkSession>& session,
+                                                        const std::shared_ptr<const sinks::SinkSession>& session,
                                                         std::string_view processName)
 {
-    KestoReportingAssertServerQueue();
+    utility::assertServerQueue();
     if (!message || type != typeGimbo || !message->contains(hapticTimeKey) || isRepeat(*message, messageCache_))
         return;
     if (leakedHapticsSessionCounter_ != 1) {
@@ -37,7 +37,7 @@ void KestoReportingUtilityVorpStateManager::handleEvent(const std::optional<foun
 }
 
 void KestoReportingUtilityVorpStateManager::requestSnapshot(AudioEventCategory category,
-                                                            const KestoReportingSinkSession& session,
+                                                            const sinks::SinkSession& session,
                                                             std::string_view processName)
 {
     KESTO_LOG(KestoReportingVorpLogCategory(), Info, "Getting snapshot with Ulmet Reporter");

@@ -3,7 +3,7 @@
 #pragma once
 
 #include "platform/BugCapture.h"
-#include "sinks/KestoReportingSinkSession.h"
+#include "sinks/SinkSession.h"
 
 #include <cstdint>
 #include <memory>
@@ -15,7 +15,7 @@ class KestoReportingUtilityVorpStateManager {
 public:
     // A message of a session, sent by a process of that name. No message is ignored.
     void handleEvent(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
-                     AudioEventType type, const std::shared_ptr<const KestoReportingSinkSession>& session,
+                     AudioEventType type, const std::shared_ptr<const sinks::SinkSession>& session,
                      std::string_view processName);
 
     // How many distinct reports were counted since the last snapshot: 0 or 1.
@@ -26,8 +26,7 @@ public:
     [[nodiscard]] const platform::BugCaptureReporter* ulmetReporter() const { return ulmetReporter_.get(); }
 
 private:
-    void requestSnapshot(AudioEventCategory category, const KestoReportingSinkSession& session,
-                         std::string_view processName);
+    void requestSnapshot(AudioEventCategory category, const sinks::SinkSession& session, std::string_view processName);
 
     std::uint64_t leakedHapticsSessionCounter_ = 0;
     foundation::Dictionary messageCache_;

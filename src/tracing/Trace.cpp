@@ -1,7 +1,7 @@
 // Passes the events to each measurement and collects the results.
 #include "tracing/Trace.h"
 
-#include "utility/KestoReportingLogCategories.h"
+#include "utility/LogCategories.h"
 
 void Trace::processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events)
 {

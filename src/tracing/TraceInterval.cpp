@@ -4,7 +4,7 @@
 // as fast, and reserving the results' memory at once some 1.3 times.
 #include "tracing/TraceInterval.h"
 
-#include "utility/KestoReportingLogCategories.h"
+#include "utility/LogCategories.h"
 
 namespace {
 

@@ -7,7 +7,7 @@
 #include "foundation/plist/PropertyList.h"
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
-#include "utility/KestoReportingLogCategories.h"
+#include "utility/LogCategories.h"
 
 #include <algorithm>
 #include <charconv>

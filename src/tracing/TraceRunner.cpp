@@ -4,7 +4,7 @@
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
 #include "tracing/TraceParams.h"
-#include "utility/KestoReportingLogCategories.h"
+#include "utility/LogCategories.h"
 
 #include <atomic>
 #include <cassert>

@@ -2,7 +2,7 @@
 #define KESTO_LOG_NAME "TraceRunner"
 #include "platform/Platform.h"
 #include "tracing/TraceRunner.h"
-#include "utility/KestoReportingLogCategories.h"
+#include "utility/LogCategories.h"
 
 #include <algorithm>
 #include <cstdlib>

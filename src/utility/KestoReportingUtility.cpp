@@ -26,7 +26,7 @@ std::chrono::steady_clock::time_point deadline(double timeout)
 
 } // namespace
 
-bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeout, const bool& flag,
+bool KestoReportingUtilityWait(utility::ConditionWithLock& condition, double timeout, const bool& flag,
                                std::string_view waitMessage, std::string_view timeoutMessage,
                                platform::LogCategory& logCategory)
 {
@@ -42,7 +42,7 @@ bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeou
     return true;
 }
 
-void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
+void KestoReportingUtilitySignal(utility::ConditionWithLock& condition, bool& flag)
 {
     const foundation::Lock lock(condition.lock);
     flag = true;
@@ -90,7 +90,7 @@ bool KestoReportingUtilityProcessInfoForPID(std::int32_t pid, platform::ProcessT
 foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Dictionary& dictionary)
 {
     static const foundation::Value unknown("Unknown");
-    const foundation::Value* name = dictionary.find(KestoReportingHostApplicationKey);
+    const foundation::Value* name = dictionary.find(utility::hostApplicationKey);
     return name == nullptr ? unknown : *name;
 }
 
@@ -139,7 +139,7 @@ foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation:
 
 foundation::Dictionary KestoReportingUtilityRemoveEventEpochTime(const foundation::Dictionary& message)
 {
-    return KestoReportingUtilityIsInternalBuild() ? message : message.without(KestoReportingTimestampKey);
+    return KestoReportingUtilityIsInternalBuild() ? message : message.without(utility::timestampKey);
 }
 
 foundation::Dictionary KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message)
@@ -184,7 +184,7 @@ foundation::Dictionary normaliseAnew(const foundation::Dictionary& message, cons
     kept.reserve(message.size());
     for (std::size_t position = 0; position < message.size(); ++position) {
         auto key = withoutBlanks(message.keys()[position]);
-        if (!keepsTime && key == KestoReportingTimestampKey)
+        if (!keepsTime && key == utility::timestampKey)
             continue;
         kept.push_back(position);
         keys.push_back(std::move(key));
@@ -200,8 +200,8 @@ foundation::Dictionary normaliseAnew(const foundation::Dictionary& message, cons
 
 } // namespace
 
-foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::Dictionary& message,
-                                                             AudioEventCategory category, AudioEventType type)
+foundation::Dictionary utility::normaliseMessage(const foundation::Dictionary& message, AudioEventCategory category,
+                                                 AudioEventType type)
 {
     const bool keepsTime = KestoReportingUtilityIsInternalBuild();
     const auto tag = audioMessageTag(category, type);

@@ -7,8 +7,8 @@
 #include "foundation/Mutex.h"
 #include "foundation/values/Value.h"
 #include "platform/ProcessTable.h"
-#include "utility/KestoReportingLogCategories.h"
-#include "utility/KestoReportingVocabulary.h"
+#include "utility/LogCategories.h"
+#include "utility/MessageKinds.h"
 
 #include <array>
 #include <cstdint>
@@ -17,24 +17,28 @@
 #include <string>
 #include <string_view>
 
+namespace utility {
+
 // The payload key of the time that a client gives a message, in seconds since 1970.
-constexpr std::string_view KestoReportingTimestampKey = "kestoreporting_timestamp";
+constexpr std::string_view timestampKey = "kestoreporting_timestamp";
 // The configuration and payload key of the application on whose behalf a client plays.
-constexpr std::string_view KestoReportingHostApplicationKey = "HostApplicationDisplayID";
+constexpr std::string_view hostApplicationKey = "HostApplicationDisplayID";
 
 // A condition variable with its own lock.
-struct KestoReportingCondition {
+struct ConditionWithLock {
     foundation::Mutex lock;
     foundation::Condition signal;
 };
 
+} // namespace utility
+
 // Waits until another thread has set the flag. Each wait lasts at most `timeout` seconds (0 for a negative number,
 // practically for ever for NaN); a wake-up without the flag begins a new wait. False if a wait timed out.
-bool KestoReportingUtilityWait(KestoReportingCondition& condition, double timeout, const bool& flag,
+bool KestoReportingUtilityWait(utility::ConditionWithLock& condition, double timeout, const bool& flag,
                                std::string_view waitMessage, std::string_view timeoutMessage,
                                platform::LogCategory& logCategory);
 // Sets the flag and wakes one waiter.
-void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag);
+void KestoReportingUtilitySignal(utility::ConditionWithLock& condition, bool& flag);
 
 // Whether the device runs an internal build. Asked once for the life of the process.
 [[nodiscard]] bool KestoReportingUtilityIsInternalBuild();
@@ -60,10 +64,13 @@ void KestoReportingUtilitySignal(KestoReportingCondition& condition, bool& flag)
 [[nodiscard]] foundation::Dictionary
 KestoReportingUtilityRemoveWhiteSpaceFromKeys(const foundation::Dictionary& message);
 
+namespace utility {
+
 // These three one after the other, blanks first and the time stamp last, at the cost of one.
-[[nodiscard]] foundation::Dictionary KestoReportingUtilityNormaliseMessage(const foundation::Dictionary& message,
-                                                                           AudioEventCategory category,
-                                                                           AudioEventType type);
+[[nodiscard]] foundation::Dictionary normaliseMessage(const foundation::Dictionary& message,
+                                                      AudioEventCategory category, AudioEventType type);
+
+} // namespace utility
 
 // Rounded to that many decimal places, halves away from zero; negative places round to tens, hundreds...
 [[nodiscard]] double KestoReportingUtilityRoundWithPlaces(double value, int places);

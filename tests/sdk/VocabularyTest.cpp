@@ -1,6 +1,6 @@
 // The numbers of the public headers are those of the service.
-#include "client/KestoReportingOperations.h"
-#include "utility/KestoReportingVocabulary.h"
+#include "client/ServiceOperations.h"
+#include "utility/MessageKinds.h"
 
 #include "kesto/kesto.hpp"
 
@@ -93,7 +93,7 @@ TEST(Vocabulary, OperationsAreTheServices)
          {Operation::GetAllReporters, "getAllReporters"},
          {Operation::KillService, "killService"}}};
     for (const auto& [operation, name] : names)
-        EXPECT_EQ(KestoReportingOperationNumbered(static_cast<std::int64_t>(operation))->name(), name);
+        EXPECT_EQ(client::serviceOperationNumbered(static_cast<std::int64_t>(operation))->name(), name);
 }
 
 TEST(Vocabulary, ServiceTypesAreTheServices)

@@ -27,7 +27,7 @@ TEST(ServiceMaking, BeginsWithTheServerQueue)
                     .name = "com.quarn.kesto.reporting.server",
                     .options = {.quality = platform::QualityOfService::UserInteractive, .mayBeHelped = true},
                     .hasTurns = true}));
-    EXPECT_FALSE(KestoReportingServerQueue()->isCurrent());
+    EXPECT_FALSE(utility::serverQueue()->isCurrent());
     EXPECT_EQ(gReportingQueueName, "com.quarn.kesto.reporting.server");
 }
 
@@ -35,9 +35,9 @@ TEST(ServiceMaking, ReplacesTheQueueOfAServiceBefore)
 {
     const TestPlatform platform;
     const auto first = KestoReportingServiceDelegate::make();
-    const auto queue = KestoReportingServerQueue();
+    const auto queue = utility::serverQueue();
     const auto second = KestoReportingServiceDelegate::make();
-    EXPECT_NE(KestoReportingServerQueue(), queue);
+    EXPECT_NE(utility::serverQueue(), queue);
 }
 
 TEST(ServiceMaking, ListensForFeaturesAndThenWatchesDrivers)

@@ -286,7 +286,7 @@ TEST_F(SessionMessagesTest, LeaveAMarkerEachRecordedOrNot)
 TEST_F(SessionMessagesTest, AreAnsweredBeforeTheCallReturnsWithNoErrorWhateverBecomesOfThem)
 {
     int replies = 0;
-    const auto reply = [&](const std::optional<KestoReportingError>& error) {
+    const auto reply = [&](const std::optional<utility::ReplyError>& error) {
         EXPECT_EQ(error, std::nullopt);
         EXPECT_THAT(platform.traceMarkers.take(), SizeIs(1)) << "the reply comes after the marker";
         ++replies;
@@ -313,7 +313,7 @@ TEST_F(SessionMessagesTest, AreHandledTheSameSynchronouslyOrNot)
 TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
 {
     support::TestPlatform platform;
-    const auto budget = std::make_shared<KestoReportingStorageBudget>(1024);
+    const auto budget = std::make_shared<session::StorageBudget>(1024);
     KestoReportingSession session(42, {7}, budget);
     session.start();
     const std::string large(600, 'x');

@@ -260,7 +260,7 @@ TEST_F(SessionStop, CountsAnewInTheNextRun)
 
 TEST_F(SessionStop, HandsVolumeEventsToTheBridgeEvenWhenThereIsNoMemoryToRecordThem)
 {
-    const auto budget = std::make_shared<KestoReportingStorageBudget>(1024);
+    const auto budget = std::make_shared<session::StorageBudget>(1024);
     session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
     session->start();
     play();
@@ -276,7 +276,7 @@ TEST_F(SessionStop, HandsVolumeEventsToTheBridgeEvenWhenThereIsNoMemoryToRecordT
 
 TEST_F(SessionStop, PaysForVolumeEventsFromItsBudgetUntilTheyAreRecorded)
 {
-    const auto budget = std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 20);
+    const auto budget = std::make_shared<session::StorageBudget>(std::size_t{1} << 20);
     session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
     session->start();
     send(0, {{"session_output_running", true}});

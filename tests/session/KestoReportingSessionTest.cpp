@@ -124,7 +124,7 @@ TEST_F(SessionTest, HoldsWhatItsClientInstanceKeepsInIt)
     session->setTransactionCompleteBlock(nullptr);
     EXPECT_FALSE(session->transactionCompleteBlock());
 
-    session->setDriverSnapShot(KestoReportingDriverSnapShot{{"Rx-(null)", {}}});
+    session->setDriverSnapShot(session::DriverSnapShot{{"Rx-(null)", {}}});
     EXPECT_THAT(*session->driverSnapShot(), SizeIs(1));
     session->setDriverSnapShot(std::nullopt);
     EXPECT_EQ(session->driverSnapShot(), std::nullopt);
@@ -269,7 +269,7 @@ TEST_F(SessionTest, TakesAConfigurationThatIsExactlyAsLargeAsItsLimitAndNoneThat
 TEST_F(SessionTest, PaysForItsConfiguration)
 {
     const Dictionary configuration{{"a", std::string(1000, 'x')}};
-    const auto budget = std::make_shared<KestoReportingStorageBudget>(3 * configuration.roughBytes() / 2);
+    const auto budget = std::make_shared<session::StorageBudget>(3 * configuration.roughBytes() / 2);
     session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
     auto other = std::make_shared<KestoReportingSession>(43, std::vector<std::int32_t>{7}, budget);
     session->setConfiguration(configuration);
@@ -293,7 +293,7 @@ TEST_F(SessionTest, PaysForItsConfiguration)
 
 TEST_F(SessionTest, HoldsThousandsOfValuesOfOneByteOnlyForWhatTheyTake)
 {
-    const auto budget = std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 20);
+    const auto budget = std::make_shared<session::StorageBudget>(std::size_t{1} << 20);
     session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
     const foundation::Array bytes(std::vector<Value>(100'000, Value(1)));
     session->setConfiguration(Dictionary{{"a", bytes}}); // 100 KB on the wire
@@ -306,14 +306,14 @@ TEST_F(SessionTest, PaysForTheDriversSnapshot)
     sample.channels.resize(10);
     for (auto& channel : sample.channels)
         channel.states.resize(10);
-    const auto budget = std::make_shared<KestoReportingStorageBudget>(10'000);
+    const auto budget = std::make_shared<session::StorageBudget>(10'000);
     session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
-    session->setDriverSnapShot(KestoReportingDriverSnapShot{{"Rx-(null)", sample}});
+    session->setDriverSnapShot(session::DriverSnapShot{{"Rx-(null)", sample}});
     EXPECT_GT(budget->taken(), 10 * sizeof(platform::ReportingChannel) + 100 * sizeof(platform::StateResidency) - 1);
     EXPECT_THAT(*session->driverSnapShot(), SizeIs(1));
 
     forget();
-    session->setDriverSnapShot(KestoReportingDriverSnapShot{{"Rx-(null)", sample}, {"Tx-(null)", sample}});
+    session->setDriverSnapShot(session::DriverSnapShot{{"Rx-(null)", sample}, {"Tx-(null)", sample}});
     EXPECT_EQ(session->driverSnapShot(), std::nullopt);
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Error, "kerr",

@@ -1,7 +1,7 @@
 // Message stores made from plain payloads, and what they hold as plain dictionaries.
 #pragma once
 
-#include "session/KestoReportingMessageStore.h"
+#include "session/MessageStore.h"
 #include "support/PrintValues.h"
 
 #include <gtest/gtest.h>
@@ -13,20 +13,20 @@
 using Messages = std::vector<foundation::Dictionary>;
 
 // A store of these payloads, all of them: as errors, of which none is dropped for being repeated.
-inline std::unique_ptr<KestoReportingMessageStore> storeOf(const Messages& payloads)
+inline std::unique_ptr<session::MessageStore> storeOf(const Messages& payloads)
 {
-    auto store = std::make_unique<KestoReportingMessageStore>(
-        std::make_shared<KestoReportingStorageBudget>(std::size_t{1} << 30));
+    auto store =
+        std::make_unique<session::MessageStore>(std::make_shared<session::StorageBudget>(std::size_t{1} << 30));
     for (const auto& payload : payloads)
-        EXPECT_EQ(store->record(AudioEventCategoryError, 1, payload), KestoReportingMessageStore::Outcome::Recorded);
+        EXPECT_EQ(store->record(AudioEventCategoryError, 1, payload), session::MessageStore::Outcome::Recorded);
     return store;
 }
 
 // Identifier to payload, one entry each.
-inline Messages messagesOf(const KestoReportingMessageStore& store)
+inline Messages messagesOf(const session::MessageStore& store)
 {
     Messages messages;
-    store.forEach([&](const KestoReportingMessageStore::Message& message) {
+    store.forEach([&](const session::MessageStore::Message& message) {
         messages.push_back({{foundation::String(store.identifier(message)), message.payload.dictionary()}});
     });
     return messages;

@@ -10,7 +10,7 @@
 #include "service/KestoReportingServiceDelegate.h"
 #include "support/TestPlatform.h"
 #include "support/fakes/FakeConnection.h"
-#include "utility/KestoReportingServerQueue.h"
+#include "utility/ServerQueue.h"
 
 #include <cstdint>
 #include <functional>
@@ -60,7 +60,7 @@ template <typename Work> auto onServerQueue(FakeWorkQueues& queues, Work work)
     };
     std::packaged_task<std::invoke_result_t<decltype(inTurn), platform::Turn&>(platform::Turn&)> task(inTurn);
     auto result = task.get_future();
-    KestoReportingServerQueue()->submit([&task](platform::Turn& turn) { task(turn); });
+    utility::serverQueue()->submit([&task](platform::Turn& turn) { task(turn); });
     queues.runAll();
     return result.get();
 }

@@ -227,7 +227,7 @@ RC_GTEST_PROP(NormalisedMessage, IsWhatTheThreeStepsMakeOfIt, (bool isInternalBu
     const auto isRight = [](const Dictionary& given, AudioEventType type) {
         const Dictionary expected = KestoReportingUtilityRemoveEventEpochTime(
             KestoReportingUtilityAddAudioMessageTag(KestoReportingUtilityRemoveWhiteSpaceFromKeys(given), 4, type));
-        return Value(KestoReportingUtilityNormaliseMessage(given, 4, type)).text() == Value(expected).text();
+        return Value(utility::normaliseMessage(given, 4, type)).text() == Value(expected).text();
     };
     RC_ASSERT(isRight(message, 1));
     std::vector<Value> others(message.size(), "other");
@@ -240,10 +240,8 @@ RC_GTEST_PROP(NormalisedMessage, IsWhatTheThreeStepsMakeOfIt, (bool isInternalBu
 TEST(NormaliseMessage, GetsTheTagOfItsOwnTypeBehindAMessageOfTheSameCategory)
 {
     const support::TestPlatform platform;
-    EXPECT_EQ(KestoReportingUtilityNormaliseMessage({{"a", 1}}, 4, 1),
-              (Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}}));
-    EXPECT_EQ(KestoReportingUtilityNormaliseMessage({{"a", 1}}, 4, 2),
-              (Dictionary{{"a", 1}, {"audiotag", "PlaybackStop"}}));
+    EXPECT_EQ(utility::normaliseMessage({{"a", 1}}, 4, 1), (Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}}));
+    EXPECT_EQ(utility::normaliseMessage({{"a", 1}}, 4, 2), (Dictionary{{"a", 1}, {"audiotag", "PlaybackStop"}}));
 }
 
 TEST(NormaliseMessage, MessagesOfOneShapeGetOneShape)
@@ -252,9 +250,9 @@ TEST(NormaliseMessage, MessagesOfOneShapeGetOneShape)
     const Dictionary first{{"a b", 1}, {"c", 2}};
     const Dictionary second = first.with("c", 3);
     EXPECT_EQ(first.shape().get(), second.shape().get());
-    const Dictionary normalised = KestoReportingUtilityNormaliseMessage(first, 4, 1);
-    EXPECT_EQ(normalised.shape().get(), KestoReportingUtilityNormaliseMessage(second, 4, 1).shape().get());
-    EXPECT_EQ(normalised.shape().get(), KestoReportingUtilityNormaliseMessage(second, 4, 2).shape().get());
+    const Dictionary normalised = utility::normaliseMessage(first, 4, 1);
+    EXPECT_EQ(normalised.shape().get(), utility::normaliseMessage(second, 4, 1).shape().get());
+    EXPECT_EQ(normalised.shape().get(), utility::normaliseMessage(second, 4, 2).shape().get());
 }
 
 // --- numbers

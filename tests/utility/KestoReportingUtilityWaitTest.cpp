@@ -38,7 +38,7 @@ protected:
     void letItFallAsleep() { letThemFallAsleep(1); }
 
     support::TestPlatform platform;
-    KestoReportingCondition condition;
+    utility::ConditionWithLock condition;
     bool flag = false;
 };
 

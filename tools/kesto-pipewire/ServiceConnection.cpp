@@ -1,7 +1,7 @@
 // libkesto's callbacks come on its own thread: they store the state, and the loop's next turn reads it.
 #include "kesto-pipewire/ServiceConnection.h"
 
-#include "utility/KestoReportingVocabulary.h"
+#include "utility/MessageKinds.h"
 
 #include <cerrno>
 #include <chrono>

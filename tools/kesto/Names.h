@@ -1,7 +1,7 @@
 // Categories, event types and service types by their names, as people write them.
 #pragma once
 
-#include "utility/KestoReportingVocabulary.h"
+#include "utility/MessageKinds.h"
 
 #include <optional>
 #include <string_view>

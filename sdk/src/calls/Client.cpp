@@ -2,7 +2,7 @@
 #include "calls/Client.h"
 
 #include "Threads.h"
-#include "client/KestoReportingOperations.h"
+#include "client/ServiceOperations.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -121,7 +121,7 @@ kesto_status kesto_client::setConfiguration(const libkesto::MessageEncoder& conf
 bool kesto_client::fits(std::size_t entryBytes, std::size_t reporterCount) const noexcept
 {
     const std::size_t most = std::min(mailbox_.largestRecord(), platform::longestFrame);
-    return reporterCount <= KestoReportingMostReportersOfAMessage
+    return reporterCount <= client::mostReportersOfAMessage
         && entryBytes + libkesto::frameOverhead(reporterCount) + sizeof(CallHead) <= most;
 }
 

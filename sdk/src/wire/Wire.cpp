@@ -1,7 +1,7 @@
 // A call's shape is known, so its frame is written straight from what the caller gave, without values in between.
 #include "wire/Wire.h"
 
-#include "client/KestoReportingOperations.h"
+#include "client/ServiceOperations.h"
 #include "platform/linux/connection/FrameReader.h"
 
 #include <cstring>
@@ -32,21 +32,21 @@ void appendReporters(const Call& call, std::string& out)
         appendReporter(reporter, out);
 }
 
-const KestoReportingOperation& operationOf(kesto_operation operation)
+const client::ServiceOperation& operationOf(kesto_operation operation)
 {
-    return *KestoReportingOperationNumbered(operation);
+    return *client::serviceOperationNumbered(operation);
 }
 
-void appendArgument(KestoReportingArgument argument, const Call& call, std::string& out)
+void appendArgument(client::OperationArgument argument, const Call& call, std::string& out)
 {
     switch (argument) {
-    case KestoReportingArgument::ReporterID: return appendReporter(call.head.reporter, out);
-    case KestoReportingArgument::Configuration:
-    case KestoReportingArgument::Message: return appendEntries(call, out);
-    case KestoReportingArgument::Category: return foundation::appendCborInteger(call.head.category, out);
-    case KestoReportingArgument::ServiceType:
-    case KestoReportingArgument::Type: return foundation::appendCborInteger(call.head.type, out);
-    case KestoReportingArgument::ReporterIDs: return appendReporters(call, out);
+    case client::OperationArgument::ReporterID: return appendReporter(call.head.reporter, out);
+    case client::OperationArgument::Configuration:
+    case client::OperationArgument::Message: return appendEntries(call, out);
+    case client::OperationArgument::Category: return foundation::appendCborInteger(call.head.category, out);
+    case client::OperationArgument::ServiceType:
+    case client::OperationArgument::Type: return foundation::appendCborInteger(call.head.type, out);
+    case client::OperationArgument::ReporterIDs: return appendReporters(call, out);
     }
 }
 
@@ -127,7 +127,7 @@ void appendCall(std::uint64_t number, const Call& call, std::string& out)
     foundation::appendCborArrayHead(2 + arguments.size(), frame);
     foundation::appendCborInteger(number, frame);
     foundation::appendCborInteger(static_cast<std::uint64_t>(call.head.operation), frame);
-    for (const KestoReportingArgument argument : arguments)
+    for (const client::OperationArgument argument : arguments)
         appendArgument(argument, call, frame);
     platform::appendFrame(frame, out);
 }
@@ -169,18 +169,18 @@ std::optional<AnswerFrame> readAnswer(std::string_view frame, foundation::CborDe
 bool readResult(const AnswerFrame& frame, kesto_answer& answer, std::vector<kesto_reporter>& reporters)
 {
     const std::span<const Value> values = frame.frame.values().subspan(2);
-    const KestoReportingResult result = operationOf(answer.operation).result();
-    if (result == KestoReportingResult::None)
+    const client::OperationResult result = operationOf(answer.operation).result();
+    if (result == client::OperationResult::None)
         return values.empty();
     if (values.size() != 1)
         return false;
     const Value& value = values.front();
     switch (result) {
-    case KestoReportingResult::None: break;
-    case KestoReportingResult::Success: return readSuccess(value, answer);
-    case KestoReportingResult::ServiceType: return readServiceType(value, answer);
-    case KestoReportingResult::Validity: return readValidity(value, answer);
-    case KestoReportingResult::ReporterIDs: return readReporters(value, answer, reporters);
+    case client::OperationResult::None: break;
+    case client::OperationResult::Success: return readSuccess(value, answer);
+    case client::OperationResult::ServiceType: return readServiceType(value, answer);
+    case client::OperationResult::Validity: return readValidity(value, answer);
+    case client::OperationResult::ReporterIDs: return readReporters(value, answer, reporters);
     }
     return false;
 }

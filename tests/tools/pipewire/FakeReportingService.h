@@ -2,7 +2,7 @@
 #pragma once
 
 #include "kesto-pipewire/ReportingService.h"
-#include "utility/KestoReportingVocabulary.h"
+#include "utility/MessageKinds.h"
 
 #include <fmt/format.h>
 

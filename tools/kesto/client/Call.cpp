@@ -2,7 +2,7 @@
 // first that does not fit ends it. A table of the tool's own adds how a person names an operation and what it calls.
 #include "kesto/client/Call.h"
 
-#include "client/KestoReportingOperations.h"
+#include "client/ServiceOperations.h"
 #include "kesto/Names.h"
 
 #include <array>
@@ -14,7 +14,7 @@ namespace {
 
 using Json = rapidjson::Value;
 
-using Argument = KestoReportingArgument;
+using Argument = client::OperationArgument;
 
 // An operation that takes a reporter and nothing else.
 using ReporterOperation = kesto::Status (kesto::Client::*)(kesto::ReporterID reporter, kesto::AnswerCallback answered);
@@ -30,7 +30,7 @@ struct Form {
     kesto::Status (*submit)(kesto::Client& client, const Call& call, kesto::AnswerCallback answered);
 };
 
-// In the order of `KestoReportingOperations`.
+// In the order of `client::serviceOperations`.
 constexpr auto forms = std::to_array<Form>({
     {"create", submitReporter<&kesto::Client::createSession>},
     {"setServiceType",
@@ -60,7 +60,7 @@ constexpr auto forms = std::to_array<Form>({
          return client.killService(std::move(answered));
      }},
 });
-static_assert(forms.size() == KestoReportingOperations.size());
+static_assert(forms.size() == client::serviceOperations.size());
 
 constexpr unsigned deepest = 30; // what the service takes inside a call
 
@@ -180,7 +180,7 @@ std::string_view description(Argument argument)
 std::optional<std::size_t> placeNamed(std::string_view name)
 {
     for (std::size_t place = 0; place < forms.size(); ++place)
-        if (KestoReportingOperations[place].name() == name || forms[place].shortName == name)
+        if (client::serviceOperations[place].name() == name || forms[place].shortName == name)
             return place;
     return std::nullopt;
 }
@@ -220,7 +220,7 @@ std::expected<Call, std::string> parseCall(std::string_view line)
         return std::unexpected(
             fmt::format("unknown operation \"{}\"; there are {}", textOf(document[0]), shortNames()));
 
-    const auto arguments = KestoReportingOperations[*place].arguments();
+    const auto arguments = client::serviceOperations[*place].arguments();
     const std::string_view name = forms[*place].shortName;
     if (document.Size() - 1 != arguments.size())
         return std::unexpected(

@@ -1,6 +1,6 @@
 // `kesto client`: every operation of the service from a shell. One JSON array a line in, one JSON object an answer
 // out, as they come.
-#include "client/KestoReportingOperations.h"
+#include "client/ServiceOperations.h"
 #include "foundation/values/Json.h"
 #include "foundation/values/Value.h"
 #include "kesto/Commands.h"
@@ -25,21 +25,21 @@ struct ClientOptions {
     double wait = 10;
 };
 
-const KestoReportingOperation& operationOf(const kesto::Answer& answer)
+const client::ServiceOperation& operationOf(const kesto::Answer& answer)
 {
-    return *KestoReportingOperationNumbered(static_cast<std::int64_t>(answer.operation()));
+    return *client::serviceOperationNumbered(static_cast<std::int64_t>(answer.operation()));
 }
 
 Value valuesOf(const kesto::Answer& answer)
 {
     switch (operationOf(answer).result()) {
-    case KestoReportingResult::None: break;
-    case KestoReportingResult::Success: return Array{answer.success()};
-    case KestoReportingResult::ServiceType: return Array{static_cast<int>(answer.serviceType())};
-    case KestoReportingResult::Validity:
+    case client::OperationResult::None: break;
+    case client::OperationResult::Success: return Array{answer.success()};
+    case client::OperationResult::ServiceType: return Array{static_cast<int>(answer.serviceType())};
+    case client::OperationResult::Validity:
         return Array{Dictionary{{"reporterID", answer.validReporter()},
                                 {"serviceType", static_cast<int>(answer.serviceType())}}};
-    case KestoReportingResult::ReporterIDs: {
+    case client::OperationResult::ReporterIDs: {
         std::vector<Value> reporters;
         for (const kesto::ReporterID reporter : answer.reporters())
             reporters.emplace_back(reporter);

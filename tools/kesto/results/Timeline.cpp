@@ -16,7 +16,7 @@ using foundation::Value;
 constexpr std::string_view volumeKind = "Volume_Summary";
 constexpr std::string_view playTime = "play_seconds";
 // Times, which have a column of their own, and keys that repeat the kind.
-constexpr std::array<std::string_view, 4> notShown{"processuptime_ms", "systemuptime_sec", KestoReportingTimestampKey,
+constexpr std::array<std::string_view, 4> notShown{"processuptime_ms", "systemuptime_sec", utility::timestampKey,
                                                    "audiotag"};
 
 // "Playback_Start" for "Playback_Start_1"; nothing if it is not an identifier.
@@ -66,7 +66,7 @@ bool Timeline::add(std::string_view identifier, const Dictionary& payload, std::
         return true;
     }
     row.emplace();
-    if (const Value* time = payload.find(KestoReportingTimestampKey)) {
+    if (const Value* time = payload.find(utility::timestampKey)) {
         if (!start_)
             start_ = time->asDouble();
         row->time = now_ = time->asDouble() - *start_;

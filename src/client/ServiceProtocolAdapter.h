@@ -1,0 +1,32 @@
+// Between the wire and the protocol: checks the array of values that a client sent, calls the operation it names,
+// and turns each reply into a frame.
+//
+// A call is [call, method, arguments...]; a reply is [call, error, values...], error being null or
+// [domain, code]. Methods are numbered from 1 in the order of the protocol.
+#pragma once
+
+#include "client/KestoReportingServiceProtocol.h"
+#include "platform/Connection.h"
+
+#include <expected>
+#include <memory>
+
+namespace client {
+
+// One a connection, which owns it; used on the connection's thread.
+class ServiceProtocolAdapter {
+public:
+    // Calls go to the exported object.
+    explicit ServiceProtocolAdapter(std::shared_ptr<KestoReportingServiceProtocol> exportedObject)
+        : exportedObject_(std::move(exportedObject))
+    {
+    }
+
+    // Carries out one call, or says what is wrong with it.
+    std::expected<void, platform::Connection::Violation> handleCall(platform::Connection::Call call);
+
+private:
+    std::shared_ptr<KestoReportingServiceProtocol> exportedObject_;
+};
+
+} // namespace client

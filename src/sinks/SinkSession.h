@@ -1,0 +1,17 @@
+// A sink's view of a session: only what it needs to name an event and the application.
+#pragma once
+
+#include "foundation/values/Value.h"
+#include "utility/MessageKinds.h"
+
+namespace sinks {
+
+// Any thread: a payload may be built after the session's own work went on.
+class SinkSession {
+public:
+    virtual ~SinkSession() = default;
+    [[nodiscard]] virtual AudioServiceType serviceType() const = 0;
+    [[nodiscard]] virtual foundation::Dictionary configuration() const = 0;
+};
+
+} // namespace sinks

@@ -1,0 +1,583 @@
+// The delivery of a message: to whom, in which order, and as whose.
+#include "client/KestoReportingClientServerInstance.h"
+#include "support/ServiceHarness.h"
+
+#include <gmock/gmock.h>
+
+namespace {
+
+using namespace support;
+using enum platform::LogLevel;
+using foundation::Array;
+using foundation::Dictionary;
+using foundation::Value;
+using testing::_;
+using testing::ElementsAre;
+using testing::IsEmpty;
+using testing::Return;
+using testing::SizeIs;
+
+constexpr std::uint32_t clientSendMessage = 0x21044824;
+constexpr std::uint32_t sessionCreated = 0x21044828;
+constexpr std::uint32_t sessionDestroyed = 0x21044834;
+constexpr std::uint32_t sessionMessageAccepted = 0x21044838;
+
+std::string described(const TestClient& client, std::int64_t reporterID)
+{
+    return Value(Array{client.session(reporterID)->description()}).text();
+}
+
+class MessagesTest : public testing::Test {
+protected:
+    explicit MessagesTest(const std::function<void(TestPlatform&)>& prepare = {}) : harness(prepare)
+    {
+        platform.analytics.use("*");
+    }
+
+    void makeSession(TestClient& client, std::int64_t reporterID, bool started = true)
+    {
+        client.call(CreateReportingSession, reporterID);
+        if (started)
+            client.call(StartReportingSessionForID, reporterID);
+        harness.forget();
+    }
+    Answers send(TestClient& client, const Value& reporterIDs, const Dictionary& message = {{"a", 1}})
+    {
+        platform.analytics.clear();
+        return client.call(SendMessage, message, 4, 1, reporterIDs);
+    }
+    // What the session recorded under its first Playback message.
+    static std::optional<Dictionary> recorded(const TestClient& client, std::int64_t reporterID)
+    {
+        const auto messages = client.session(reporterID)->nestedAggregatedPayloadData().value();
+        for (const auto& message : messages)
+            if (const Value* payload = message.find("Playback_Start_1"))
+                return payload->dictionary();
+        return std::nullopt;
+    }
+
+    ServiceHarness harness;
+    TestPlatform& platform = harness.platform;
+    TestClient player = harness.connect("player");
+    TestClient recorder = harness.connect("recorder");
+};
+
+// --- to a list of reporters
+
+TEST_F(MessagesTest, ReachTheSessionTheyAreFor)
+{
+    makeSession(player, 42);
+    makeSession(player, 43);
+    EXPECT_EQ(send(player, Array{42}), answeredOnce(delivered));
+    EXPECT_EQ(recorded(player, 42), (Dictionary{{"a", 1}, {"audiotag", "PlaybackStart"}}));
+    EXPECT_EQ(recorded(player, 43), std::nullopt);
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Debug, "kerc", "sending message for reporter [42]"),
+                            IsLine(Debug, "kerr", "sending message for session owned by 42")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage, sessionMessageAccepted));
+    EXPECT_THAT(platform.analytics.sent(),
+                ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.generic.Playback.Start"));
+}
+
+TEST_F(MessagesTest, LeaveTheDeviceAsTheClientSentThem)
+{
+    makeSession(player, 42);
+    player.call(SetConfiguration, Dictionary{{"HostApplicationDisplayID", "org.player"}}, 42);
+    send(player, Array{42}, {{"a key", 1}, {"kestoreporting_timestamp", 2.5}});
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Playback.Start"),
+                ElementsAre(Dictionary{
+                    {"a key", 1}, {"kestoreporting_timestamp", 2.5}, {"HostApplicationDisplayID", "org.player"}}));
+}
+
+TEST_F(MessagesTest, LeaveTheDeviceEvenWhenTheSessionDropsOrCannotRecordThem)
+{
+    makeSession(player, 42);
+    makeSession(player, 43, false);
+    send(player, Array{42});
+    send(player, Array{42});
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2));
+    send(player, Array{43});
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2));
+}
+
+TEST_F(MessagesTest, ReachEverySessionOfTheirListInItsOrderAsOftenAsItStandsThere)
+{
+    makeSession(player, 42);
+    makeSession(recorder, 43);
+    EXPECT_EQ(send(player, Array{43, 42, 43}), answeredOnce(delivered));
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Debug, "kerc", "sending message for reporter [43,42,43]"),
+                            IsLine(Info, "kers", "found reporting session 43 for client 1002"),
+                            IsLine(Debug, "kerr", "sending message for session owned by 43"),
+                            IsLine(Debug, "kerr", "sending message for session owned by 42"),
+                            IsLine(Info, "kers", "found reporting session 43 for client 1002"),
+                            IsLine(Debug, "kerr", "sending message for session owned by 43"),
+                            IsLine(Debug, "kerr", "dropping redundant event")));
+    EXPECT_NE(recorded(recorder, 43), std::nullopt);
+}
+
+TEST_F(MessagesTest, SkipZeroAndIDsThatNobodyHas)
+{
+    makeSession(player, 42);
+    makeSession(player, 0, false);
+    support::onServerQueue(harness.platform.workQueues, [&] { player.session(0)->start(); });
+    harness.forget();
+    EXPECT_EQ(send(player, Array{0, 99}), answeredOnce(delivered));
+    EXPECT_THAT(platform.analytics.asked(), IsEmpty());
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Debug, "kerc", "sending message for reporter [0,99]"),
+                            IsLine(Error, "kers", "failed to find reporting session 99")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage));
+    EXPECT_EQ(send(player, Array{0, 42, 99}), answeredOnce(delivered));
+    EXPECT_NE(recorded(player, 42), std::nullopt);
+}
+
+// A large message to many sessions would hold up all clients.
+TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
+{
+    constexpr std::int64_t sessions = 100;
+    constexpr std::size_t most = KestoReportingClientServerInstance::mostBytesOfADelivery;
+    std::vector<Value> reporterIDs{0, 4711};
+    for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID) {
+        makeSession(player, reporterID, false);
+        reporterIDs.emplace_back(reporterID);
+    }
+    const Dictionary large{{"a", std::string(1'000'000, 'x')}};
+    const auto receivers = static_cast<std::int64_t>(most / large.roughBytes());
+    ASSERT_LT(receivers, sessions);
+    const auto told = [&](int pid) {
+        return IsLine(Error, "kerc",
+                      "a message of client " + std::to_string(pid) + " is not delivered to "
+                          + std::to_string(sessions - receivers)
+                          + " sessions: it may take 67108864 bytes at all who receive it; further ones are counted "
+                            "until the client goes");
+    };
+    EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered)) << "the client is answered as always";
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers)) << "and those that there are not do not count";
+    EXPECT_EQ(send(player, Array(reporterIDs)), answeredOnce(delivered));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * sessions)) << "a small one reaches all";
+
+    for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID)
+        player.call(StartReportingSessionForID, reporterID);
+    EXPECT_EQ(send(recorder, null, large), answeredOnce(delivered));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1002)).Times(1));
+    EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1)) << "the log has the first";
+
+    platform.analytics.clear();
+    player.close();
+    recorder.close();
+    const auto refused = [&](int pid, std::int64_t times) {
+        return IsLine(Error, "kerc",
+                      "messages of client " + std::to_string(pid) + " were not delivered " + std::to_string(times)
+                          + " times: one may take 67108864 bytes at all who receive it");
+    };
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1001, 2 * (sessions - receivers))).Times(1));
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1002, sessions - receivers)).Times(1));
+}
+
+TEST_F(MessagesTest, AreDeliveredToOneSessionWhateverTheirSize)
+{
+    makeSession(player, 42);
+    EXPECT_EQ(send(player, Array{42}, {{"a", Array(std::vector<Value>(500'000, Value(Array{})))}}),
+              answeredOnce(delivered));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2));
+}
+
+TEST_F(MessagesTest, ToAnEmptyListReachNobody)
+{
+    makeSession(player, 42);
+    EXPECT_EQ(send(player, Array{}), answeredOnce(delivered));
+    EXPECT_EQ(recorded(player, 42), std::nullopt);
+    EXPECT_THAT(platform.analytics.asked(), IsEmpty());
+    EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerc", "sending message for reporter []")));
+}
+
+// --- to all sessions
+
+TEST_F(MessagesTest, WithoutAListReachTheStartedSessionsOfAllClients)
+{
+    makeSession(recorder, 43);
+    makeSession(player, 42);
+    makeSession(player, 41, false);
+    makeSession(player, 40);
+    const std::string sessions = Value(Array{player.session(42)->description(), player.session(40)->description(),
+                                             recorder.session(43)->description()})
+                                     .text();
+    const std::string ofPlayer = Value(Array{player.session(42)->description(), player.session(41)->description(),
+                                             player.session(40)->description()})
+                                     .text();
+    EXPECT_EQ(send(player, null), answeredOnce(delivered));
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Debug, "kerc", "sending message for reporter (null)"),
+                            IsLine(Default, "kers", "sessions for client 1001 : " + ofPlayer),
+                            IsLine(Default, "kers", "sessions for client 1002 : " + described(recorder, 43)),
+                            IsLine(Default, "kerc", "active reporting sessions 3 : " + sessions),
+                            IsLine(Debug, "kerr", "sending message for session owned by 42"),
+                            IsLine(Debug, "kerr", "sending message for session owned by 40"),
+                            IsLine(Debug, "kerr", "sending message for session owned by 43")));
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(6));
+    for (const std::int64_t reporterID : {40, 42})
+        EXPECT_NE(recorded(player, reporterID), std::nullopt);
+    EXPECT_NE(recorded(recorder, 43), std::nullopt);
+}
+
+TEST_F(MessagesTest, WithoutAListReachAStartedSessionZeroToo)
+{
+    makeSession(player, 0, false);
+    support::onServerQueue(harness.platform.workQueues, [&] { player.session(0)->start(); });
+    send(player, null);
+    EXPECT_NE(recorded(player, 0), std::nullopt);
+}
+
+// --- to nobody's session
+
+TEST_F(MessagesTest, WithoutAListAndAnyStartedSessionAreDeliveredOnceThroughAStandaloneOne)
+{
+    makeSession(player, 42, false);
+    EXPECT_EQ(send(player, null), answeredOnce(delivered));
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Debug, "kerc", "sending message for reporter (null)"),
+                            IsLine(Default, "kers", "sessions for client 1001 : " + described(player, 42)),
+                            IsLine(Default, "kers", "sessions for client 1002 : []"),
+                            IsLine(Default, "kerc", "active reporting sessions 0 : []"),
+                            IsLine(Info, "kerr", "created reporting session for ID: 1"),
+                            IsLine(Info, "kerr", "setting service type standalone"),
+                            IsLine(Debug, "kerr", "sending message for session owned by 1")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage, sessionCreated, sessionMessageAccepted));
+    EXPECT_THAT(platform.analytics.events(),
+                ElementsAre(AnalyticsEvent{"com.quarn.kesto.Playback.Start",
+                                           {{"a", 1}, {"HostApplicationDisplayID", "Unknown"}}},
+                            AnalyticsEvent{"com.quarn.standalone.Playback.Start",
+                                           {{"a", 1}, {"HostApplicationDisplayID", "Unknown"}}}));
+}
+
+TEST_F(MessagesTest, LetGoOfTheStandaloneSession)
+{
+    send(player, null);
+    EXPECT_EQ(player.session(1), nullptr);
+    EXPECT_EQ(player.call(GetAllReporters), answeredOnce({null, Array{}}));
+    platform.analytics.clear(); // which held it for a payload to come
+    EXPECT_EQ(platform.log.lines().back().message, "deallocing this session 1");
+    EXPECT_EQ(platform.traceMarkers.take().back(), sessionDestroyed);
+}
+
+// --- order
+
+// One journal of what happens at the session, the analytics bridge and the bug-capture manager.
+class DeliveryOrderTest : public MessagesTest {
+protected:
+    DeliveryOrderTest() : MessagesTest([](TestPlatform& prepared) { prepared.deviceProperties.setInternalBuild(true); })
+    {
+        platform.analytics.setObserver([this](const std::string& name) { journal.push_back("asked " + name); });
+        platform.log.setObserver([this](const LogLine& line) {
+            if (line.message.starts_with("sending message for session") || line.tag == "kerb")
+                journal.push_back(line.message);
+        });
+    }
+
+    void sendHapticTime(const Value& reporterIDs, int seconds)
+    {
+        journal.clear();
+        recorder.call(SendMessage, Dictionary{{"Haptic_Active_Hardware_Time_Seconds", seconds}}, 4, 8, reporterIDs);
+    }
+
+    std::vector<std::string> journal;
+};
+
+TEST_F(DeliveryOrderTest, PutsTheSessionLastForAList)
+{
+    makeSession(player, 42);
+    sendHapticTime(Array{42}, 1);
+    EXPECT_THAT(journal,
+                ElementsAre("asked com.quarn.kesto.Playback.Gimbo", "asked com.quarn.generic.Playback.Gimbo",
+                            "Incrementing Vorp counter. recorder", "sending message for session owned by 42"));
+}
+
+TEST_F(DeliveryOrderTest, PutsTheSessionFirstWithoutAList)
+{
+    makeSession(player, 42);
+    sendHapticTime(null, 1);
+    EXPECT_THAT(journal,
+                ElementsAre("sending message for session owned by 42", "asked com.quarn.kesto.Playback.Gimbo",
+                            "asked com.quarn.generic.Playback.Gimbo", "Incrementing Vorp counter. recorder"));
+}
+
+TEST_F(DeliveryOrderTest, PutsTheStandaloneSessionLast)
+{
+    sendHapticTime(null, 1);
+    EXPECT_THAT(journal,
+                ElementsAre("asked com.quarn.kesto.Playback.Gimbo", "asked com.quarn.standalone.Playback.Gimbo",
+                            "Incrementing Vorp counter. recorder", "sending message for session owned by 1"));
+}
+
+// --- what the client asks of the service
+
+class MockService : public KestoReportingServiceDelegateProtocol {
+public:
+    MOCK_METHOD(Dictionary, getDefaults, (), (const, override));
+    MOCK_METHOD(std::optional<Dictionary>, getFeaturesState, (), (override));
+    MOCK_METHOD(const Clients&, getAllClients, (), (const, override));
+    MOCK_METHOD(bool, isReportingEnabled, (), (const, override));
+    MOCK_METHOD(Sessions, getAllActiveReportingSessions, (), (override));
+    MOCK_METHOD(std::shared_ptr<KestoReportingSession>, findReportingSessionForID, (std::int64_t), (override));
+    MOCK_METHOD(session::DriverSnapShot, getSnapShot, (), (override));
+    MOCK_METHOD(void, sendDriverLogsForSession, (platform::Turn&, const std::shared_ptr<KestoReportingSession>&),
+                (override));
+    MOCK_METHOD(void, removeClient, (const std::shared_ptr<KestoReportingClientServerInstance>&), (override));
+    MOCK_METHOD(void, handleEventForVorp,
+                (const Dictionary&, AudioEventCategory, std::uint16_t, const std::shared_ptr<KestoReportingSession>&,
+                 const std::string&),
+                (override));
+    MOCK_METHOD(std::int64_t, activeSessionCount, (), (const, override));
+    MOCK_METHOD(void, setActiveSessionCount, (std::int64_t), (override));
+    MOCK_METHOD(void, reporterIDAdded, (std::int64_t, const KestoReportingClientServerInstance&), (override));
+    MOCK_METHOD(void, reporterIDRemoved, (std::int64_t, const KestoReportingClientServerInstance&), (override));
+};
+
+class ClientAndServiceTest : public testing::Test {
+protected:
+    ClientAndServiceTest()
+    {
+        utility::createServerQueue();
+        client = std::make_shared<KestoReportingClientServerInstance>(17, service);
+        ON_CALL(*service, isReportingEnabled).WillByDefault(Return(true));
+    }
+
+    void createSession(std::int64_t reporterID)
+    {
+        client->createReportingSession(reporterID, [](auto&, const auto&, bool) { });
+        platform.workQueues.runAll();
+    }
+    // The error of each answer.
+    std::vector<std::optional<utility::ReplyError>> send(std::optional<std::vector<std::int64_t>> reporterIDs)
+    {
+        std::vector<std::optional<utility::ReplyError>> answers;
+        client->sendMessage({{"a", 1}}, 0x10000004, 2, std::move(reporterIDs),
+                            [&](auto&, const auto& error) { answers.push_back(error); });
+        platform.workQueues.runAll();
+        return answers;
+    }
+    [[nodiscard]] std::shared_ptr<KestoReportingSession> session(std::int64_t reporterID) const
+    {
+        return client->clientReportingSessionMap().find(reporterID);
+    }
+
+    TestPlatform platform;
+    std::shared_ptr<testing::NiceMock<MockService>> service = std::make_shared<testing::NiceMock<MockService>>();
+    std::shared_ptr<KestoReportingClientServerInstance> client;
+};
+
+TEST_F(ClientAndServiceTest, AnswersAMessageWithAnErrorAndDeliversNothingWhenReportingIsDisabled)
+{
+    platform.analytics.use("*");
+    createSession(42);
+    platform.log.clear();
+    platform.traceMarkers.take();
+    EXPECT_CALL(*service, isReportingEnabled).WillRepeatedly(Return(false));
+    EXPECT_CALL(*service, handleEventForVorp).Times(0);
+    EXPECT_CALL(*service, getAllActiveReportingSessions).Times(0);
+
+    const utility::ReplyError disabled{"com.quarn.audio.reporting", 1};
+    EXPECT_THAT(send(std::vector<std::int64_t>{42}), ElementsAre(disabled));
+    EXPECT_THAT(send(std::nullopt), ElementsAre(disabled));
+    EXPECT_THAT(platform.analytics.asked(), IsEmpty());
+    EXPECT_THAT(platform.log.lines(),
+                ElementsAre(IsLine(Debug, "kerc", "sending message for reporter [42]"),
+                            IsLine(Debug, "kerc", "sending message for reporter (null)")));
+    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage, clientSendMessage));
+}
+
+TEST_F(ClientAndServiceTest, HandsTheMessageItsSessionAndTheSendersNameToTheBugCaptureManager)
+{
+    createSession(42);
+    platform.processTable.add(17, "client");
+    platform.processTable.add(18, "caller");
+    EXPECT_CALL(*service, handleEventForVorp(Dictionary{{"a", 1}}, 0x10000004, 2, session(42), "caller"));
+    EXPECT_CALL(*service, handleEventForVorp(_, _, _, session(42), "client"));
+    EXPECT_CALL(*service, handleEventForVorp(_, _, _, session(42), "(null)"));
+    {
+        // Whoever makes the call, not whoever the client was made for.
+        const FakeConnection callers(18);
+        const platform::Connection::CallScope call(callers);
+        send(std::vector<std::int64_t>{42});
+    }
+    send(std::vector<std::int64_t>{42});
+    platform.processTable.remove(17);
+    send(std::vector<std::int64_t>{42});
+}
+
+TEST_F(ClientAndServiceTest, TellsWhichProcessSentTheMessageWhileTheBugCaptureManagerHasIt)
+{
+    createSession(42);
+    const FakeConnection callers(18);
+    const auto sendFromBoth = [&](const auto& reporterIDs) {
+        {
+            const platform::Connection::CallScope call(callers);
+            send(reporterIDs);
+        }
+        send(reporterIDs);
+    };
+    ON_CALL(*service, getAllActiveReportingSessions).WillByDefault([&] { return std::vector{session(42)}; });
+    std::vector<std::int32_t> senders;
+    ON_CALL(*service, handleEventForVorp).WillByDefault([&](auto&, auto, auto, auto&, auto&) {
+        senders.push_back(platform::BugCapture::currentSender());
+    });
+    sendFromBoth(std::optional(std::vector<std::int64_t>{42}));
+    sendFromBoth(std::optional<std::vector<std::int64_t>>());
+    EXPECT_THAT(senders, ElementsAre(18, 17, 18, 17));
+    EXPECT_EQ(platform::BugCapture::currentSender(), 0);
+}
+
+TEST_F(ClientAndServiceTest, TakesTheSendersNameWhenTheCallIsMade)
+{
+    createSession(42);
+    platform.processTable.add(17, "player");
+    EXPECT_CALL(*service, handleEventForVorp(_, _, _, _, "player"));
+    client->sendMessage({}, 4, 1, std::vector<std::int64_t>{42}, [](auto&, const auto&) { });
+    platform.processTable.remove(17);
+    platform.workQueues.runAll();
+}
+
+TEST_F(ClientAndServiceTest, MakesTheStandaloneSessionOfTheServiceItselfAndItsDefaults)
+{
+    EXPECT_CALL(*service, getDefaults)
+        .WillOnce(Return(Dictionary{{"device_name", "Speaker"}, {"disable_reporting", 0}}));
+    std::weak_ptr<KestoReportingSession> standalone;
+    EXPECT_CALL(*service, handleEventForVorp).WillOnce([&](auto&, auto, auto, const auto& session, auto&) {
+        standalone = session;
+        EXPECT_EQ(session->reporterID(), 1);
+        EXPECT_THAT(session->processIdentifiers(), ElementsAre(FakeProcessTable::ownPID));
+        EXPECT_EQ(session->serviceType(), 5);
+        EXPECT_EQ(session->configuration(),
+                  (Dictionary{
+                      {"HostApplicationDisplayID", "Unknown"}, {"device_name", "Speaker"}, {"disable_reporting", 0}}));
+        EXPECT_FALSE(session->started());
+    });
+    EXPECT_THAT(send(std::nullopt), ElementsAre(std::nullopt));
+    EXPECT_TRUE(standalone.expired());
+    EXPECT_EQ(client->clientReportingSessionMap().size(), 0U);
+}
+
+TEST_F(ClientAndServiceTest, LetsTheDefaultsSpeakLastInTheStandaloneSessionsConfiguration)
+{
+    EXPECT_CALL(*service, getDefaults).WillOnce(Return(Dictionary{{"HostApplicationDisplayID", "default"}}));
+    EXPECT_CALL(*service, handleEventForVorp).WillOnce([](auto&, auto, auto, const auto& session, auto&) {
+        EXPECT_EQ(session->configuration(), (Dictionary{{"HostApplicationDisplayID", "default"}}));
+    });
+    send(std::nullopt);
+}
+
+TEST_F(ClientAndServiceTest, StartsInOrder)
+{
+    createSession(42);
+    const session::DriverSnapShot snapShot{{"Rx-(null)", {}}};
+    int answers = 0;
+    testing::MockFunction<void()> earlierCallback;
+    session(42)->setTransactionCompleteBlock([&](auto&, const auto&, bool) { earlierCallback.Call(); });
+
+    const testing::InSequence inOrder;
+    EXPECT_CALL(*service, getSnapShot).WillOnce([&] {
+        EXPECT_TRUE(session(42)->started());
+        return snapShot;
+    });
+    EXPECT_CALL(earlierCallback, Call).WillOnce([&] {
+        EXPECT_EQ(session(42)->driverSnapShot()->begin()->first, "Rx-(null)");
+    });
+    EXPECT_CALL(*service, getFeaturesState).WillOnce([&] {
+        session(42)->transactionCompleteBlock()(platform.turn, std::nullopt, true); // the new one is stored by now
+        EXPECT_EQ(answers, 1);
+        return Dictionary{{"ringerstate", true}};
+    });
+    EXPECT_CALL(*service, getAllActiveReportingSessions).WillOnce([&] {
+        EXPECT_THAT(*session(42)->nestedAggregatedPayloadData(), SizeIs(1)) << "the features were told";
+        return KestoReportingServiceDelegateProtocol::Sessions{};
+    });
+    client->startReportingSessionForID(42, [&](auto&, const auto&, bool) { ++answers; });
+    platform.workQueues.runAll();
+}
+
+TEST_F(ClientAndServiceTest, StopsInOrder)
+{
+    createSession(42);
+    ON_CALL(*service, getSnapShot).WillByDefault(Return(session::DriverSnapShot{{"Rx-(null)", {}}}));
+    testing::MockFunction<void()> startAnswer;
+    testing::MockFunction<void()> stopAnswer;
+    client->startReportingSessionForID(42, [&](auto&, const auto&, bool) { startAnswer.Call(); });
+    platform.workQueues.runAll();
+
+    const testing::InSequence inOrder;
+    EXPECT_CALL(*service, sendDriverLogsForSession(_, session(42))).WillOnce([](auto&, const auto& stopping) {
+        EXPECT_TRUE(stopping->started());
+        EXPECT_NE(stopping->driverSnapShot(), std::nullopt);
+    });
+    EXPECT_CALL(startAnswer, Call).WillOnce([&] {
+        EXPECT_FALSE(session(42)->started());
+        EXPECT_EQ(session(42)->driverSnapShot(), std::nullopt);
+    });
+    EXPECT_CALL(*service, getAllActiveReportingSessions).WillOnce([&] {
+        EXPECT_FALSE(session(42)->transactionCompleteBlock());
+        return KestoReportingServiceDelegateProtocol::Sessions{};
+    });
+    EXPECT_CALL(stopAnswer, Call);
+    client->stopReportingSessionForID(42, [&](auto&, const auto&, bool) { stopAnswer.Call(); });
+    platform.workQueues.runAll();
+}
+
+TEST_F(ClientAndServiceTest, SendsNoDriverLogsForASessionThatIsDestroyedOrLost)
+{
+    createSession(42);
+    createSession(43);
+    for (const std::int64_t reporterID : {42, 43})
+        client->startReportingSessionForID(reporterID, [](auto&, const auto&, bool) { });
+    platform.workQueues.runAll();
+    EXPECT_CALL(*service, sendDriverLogsForSession).Times(0);
+    const KestoReportingServiceDelegateProtocol::Clients clients{client};
+    ON_CALL(*service, getAllClients).WillByDefault(testing::ReturnRef(clients));
+    client->destroyReportingSession(42, [](auto&, const auto&, bool) { });
+    client->handleConnectionError();
+    platform.workQueues.runAll();
+    EXPECT_EQ(client->clientReportingSessionMap().size(), 0U);
+}
+
+TEST_F(ClientAndServiceTest, ShowsTheServicesCountOfActiveSessionsWhateverItIs)
+{
+    createSession(42);
+    ON_CALL(*service, activeSessionCount).WillByDefault(Return(-7));
+    client->startReportingSessionForID(42, [](auto&, const auto&, bool) { });
+    platform.workQueues.runAll();
+    EXPECT_THAT(platform.log.lines("kerc").back(), IsLine(Default, "kerc", "-7 active reporting session(s) []"));
+}
+
+TEST_F(ClientAndServiceTest, TellsTheServiceWhichIDsItsMapGainsAndLoses)
+{
+    const testing::InSequence inOrder;
+    EXPECT_CALL(*service, reporterIDAdded(42, testing::Ref(*client)));
+    EXPECT_CALL(*service, reporterIDAdded(0, testing::Ref(*client)));
+    EXPECT_CALL(*service, reporterIDRemoved(42, testing::Ref(*client)));
+    EXPECT_CALL(*service, reporterIDRemoved(0, testing::Ref(*client)));
+    EXPECT_CALL(*service, removeClient(client));
+    const KestoReportingServiceDelegateProtocol::Clients clients{client};
+    ON_CALL(*service, getAllClients).WillByDefault(testing::ReturnRef(clients));
+    createSession(42);
+    createSession(0);
+    client->destroyReportingSession(42, [](auto&, const auto&, bool) { });
+    client->handleConnectionError();
+    platform.workQueues.runAll();
+}
+
+TEST_F(ClientAndServiceTest, PaysForItsMessagesFromTheServicesBudget)
+{
+    const auto& budget = session::StorageBudget::service();
+    const std::size_t before = budget->taken();
+    createSession(42);
+    support::onServerQueue(platform.workQueues, [&] { session(42)->start(); });
+    EXPECT_THAT(send(std::vector<std::int64_t>{42}), SizeIs(1));
+    EXPECT_GT(budget->taken(), before);
+    client.reset();
+    EXPECT_EQ(budget->taken(), before);
+}
+
+} // namespace

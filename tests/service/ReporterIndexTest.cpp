@@ -1,0 +1,107 @@
+// Finding a session over all clients, compared with its definition: a walk over the registry that stops at the first
+// client with the ID.
+#include "service/ReporterIndex.h"
+#include "support/ServiceHarness.h"
+
+#include <array>
+#include <gtest/gtest.h>
+#include <rapidcheck/gtest.h>
+
+namespace {
+
+using namespace support;
+
+std::shared_ptr<KestoReportingSession> walk(const KestoReportingServiceDelegate& service, std::int64_t reporterID)
+{
+    if (reporterID == 0)
+        return nullptr;
+    for (const auto& client : service.getAllClients())
+        if (auto session = client->clientReportingSessionMap().find(reporterID))
+            return session;
+    return nullptr;
+}
+
+RC_GTEST_PROP(ReporterIndex, FindsWhatAWalkOverTheRegistryFinds, ())
+{
+    ServiceHarness harness;
+    std::vector<TestClient> clients;
+    const auto operation = rc::gen::tuple(rc::gen::weightedElement<char>({{3, '+'}, {1, '-'}, {8, 'c'}, {5, 'd'}}),
+                                          rc::gen::inRange<std::size_t>(0, 100), rc::gen::inRange<std::int64_t>(-2, 4));
+    for (const auto& [what, choice, reporterID] :
+         *rc::gen::container<std::vector<std::tuple<char, std::size_t, std::int64_t>>>(operation)) {
+        if (what == '+' || clients.empty()) {
+            clients.push_back(harness.connect());
+            continue;
+        }
+        const auto chosen = clients.begin() + static_cast<std::ptrdiff_t>(choice % clients.size());
+        if (what == '-') {
+            if (choice % 2 == 0)
+                chosen->close();
+            else
+                chosen->breakOff();
+            clients.erase(chosen);
+        } else {
+            chosen->call(what == 'c' ? CreateReportingSession : DestroyReportingSession, reporterID);
+        }
+        for (std::int64_t other = -2; other < 4; ++other)
+            RC_ASSERT(harness.find(other) == walk(*harness.service, other));
+    }
+}
+
+class BareIndexTest : public testing::Test {
+protected:
+    [[nodiscard]] const KestoReportingClientServerInstance& client(std::size_t number) const
+    {
+        return clients_[number];
+    }
+
+    service::ReporterIndex index;
+
+private:
+    const TestPlatform platform_;
+    const std::weak_ptr<KestoReportingServiceDelegateProtocol> nobody_;
+    const std::array<KestoReportingClientServerInstance, 2> clients_{{{1001, nobody_}, {1002, nobody_}}};
+};
+
+TEST_F(BareIndexTest, DoesNotCountClientsThatAreNotRegistered)
+{
+    index.add(42, client(0));
+    EXPECT_EQ(index.find(42), nullptr);
+    index.remove(42, client(0));
+}
+
+TEST_F(BareIndexTest, KeepsTheOrderOfRegistrationForAnyOrderOfCreation)
+{
+    index.registerClient(client(1));
+    index.registerClient(client(0));
+    index.add(42, client(0));
+    EXPECT_EQ(index.find(42), &client(0));
+    index.add(42, client(1));
+    EXPECT_EQ(index.find(42), &client(1));
+    index.remove(42, client(1));
+    EXPECT_EQ(index.find(42), &client(0));
+}
+
+TEST_F(BareIndexTest, CountsAnIDOnceAndForgetsItAtOnce)
+{
+    index.registerClient(client(0));
+    index.add(42, client(0));
+    index.add(42, client(0));
+    index.remove(42, client(0));
+    EXPECT_EQ(index.find(42), nullptr);
+    index.remove(42, client(0));
+    EXPECT_EQ(index.find(42), nullptr);
+}
+
+TEST_F(BareIndexTest, PutsAClientThatComesAgainBehindTheOthers)
+{
+    index.registerClient(client(0));
+    index.registerClient(client(1));
+    index.unregisterClient(client(0));
+    index.registerClient(client(0));
+    index.add(42, client(0));
+    index.add(42, client(1));
+    EXPECT_EQ(index.find(42), &client(1));
+}
+
+} // namespace

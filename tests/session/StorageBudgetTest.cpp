@@ -1,0 +1,103 @@
+// No client, and not all of them together, may fill the device's memory with messages.
+#include "session/StorageBudget.h"
+
+#include <gtest/gtest.h>
+#include <limits>
+#include <rapidcheck/gtest.h>
+#include <vector>
+
+namespace {
+
+TEST(StorageBudget, GivesUpToItsLimit)
+{
+    session::StorageBudget budget(100);
+    EXPECT_TRUE(budget.take(60));
+    EXPECT_FALSE(budget.take(41));
+    EXPECT_EQ(budget.taken(), 60U);
+    EXPECT_TRUE(budget.take(40));
+    EXPECT_FALSE(budget.take(1));
+    EXPECT_TRUE(budget.take(0));
+}
+
+TEST(StorageBudget, GivesAgainWhatWasGivenBack)
+{
+    session::StorageBudget budget(100);
+    EXPECT_TRUE(budget.take(100));
+    budget.giveBack(30);
+    EXPECT_EQ(budget.taken(), 70U);
+    EXPECT_TRUE(budget.take(30));
+}
+
+TEST(StorageBudget, IsNotFooledByEnormousNumbers)
+{
+    session::StorageBudget budget(100);
+    EXPECT_TRUE(budget.take(50));
+    EXPECT_FALSE(budget.take(std::numeric_limits<std::size_t>::max()));
+    EXPECT_FALSE(budget.take(std::numeric_limits<std::size_t>::max() - 49));
+    EXPECT_EQ(budget.taken(), 50U);
+}
+
+TEST(StorageBudget, TakesFromTheEnclosingOneToo)
+{
+    const auto whole = std::make_shared<session::StorageBudget>(100);
+    session::StorageBudget first(80, whole);
+    session::StorageBudget second(80, whole);
+    EXPECT_TRUE(first.take(70));
+    EXPECT_FALSE(second.take(31)) << "the whole has 30 left";
+    EXPECT_EQ(second.taken(), 0U) << "what the whole refuses is not taken here either";
+    EXPECT_TRUE(second.take(30));
+    EXPECT_EQ(whole->taken(), 100U);
+    first.giveBack(70);
+    EXPECT_EQ(whole->taken(), 30U);
+}
+
+TEST(StorageBudget, LeavesRoomForASecondClientWhenOneIsFull)
+{
+    EXPECT_GE(session::StorageBudget::serviceLimit, 2 * session::StorageBudget::clientLimit);
+}
+
+TEST(StorageShare, GrowsAndShrinksWithWhatItPaysForAndGivesAllBackInTheEnd)
+{
+    const auto budget = std::make_shared<session::StorageBudget>(100);
+    {
+        session::StorageShare share(budget);
+        EXPECT_TRUE(share.grow(60));
+        EXPECT_FALSE(share.grow(41));
+        EXPECT_EQ(share.bytes(), 60U);
+        EXPECT_TRUE(share.resize(90));
+        EXPECT_FALSE(share.resize(101));
+        EXPECT_EQ(budget->taken(), 90U) << "what is refused changes nothing";
+        EXPECT_TRUE(share.resize(20));
+        share.shrink(5);
+        EXPECT_EQ(share.bytes(), 15U);
+        EXPECT_EQ(budget->taken(), 15U);
+    }
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
+RC_GTEST_PROP(StorageBudget, IsTheSumOfWhatIsHeldAndNeverAboveItsLimit, ())
+{
+    constexpr std::size_t limit = 1000;
+    const auto whole = std::make_shared<session::StorageBudget>(limit);
+    session::StorageBudget part(limit / 2, whole);
+    std::vector<std::size_t> held;
+    std::size_t sum = 0;
+    for (const auto bytes : *rc::gen::container<std::vector<std::size_t>>(rc::gen::inRange<std::size_t>(0, 400))) {
+        if (bytes % 3 == 0 && !held.empty()) {
+            part.giveBack(held.back());
+            sum -= held.back();
+            held.pop_back();
+            continue;
+        }
+        const bool fits = sum + bytes <= limit / 2;
+        RC_ASSERT(part.take(bytes) == fits);
+        if (fits) {
+            held.push_back(bytes);
+            sum += bytes;
+        }
+        RC_ASSERT(part.taken() == sum);
+        RC_ASSERT(whole->taken() == sum);
+    }
+}
+
+} // namespace
