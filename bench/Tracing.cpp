@@ -3,11 +3,11 @@
 // bytes.
 #include "Groups.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
-#include "platform/linux/trace/TraceMarker.h"
-#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/EmitterAccess.h"
+#include "platform/linux/trace/EmitterInterface.h"
 #include "platform/linux/trace/TraceMerger.h"
+#include "platform/linux/trace/TracefsEmitter.h"
 #include "platform/linux/trace/TracefsInstance.h"
-#include "platform/linux/trace/TracefsMarkers.h"
 #include "support/ChildProcess.h"
 
 #include <cerrno>
@@ -43,10 +43,10 @@ std::vector<std::byte> pageOf(std::uint64_t time, std::uint32_t distance, std::s
     std::size_t place = headSize;
     for (; place + 4 + recordSize <= pageSize; place += 4 + recordSize) {
         const std::uint32_t head = words | distance << 5;
-        const platform::TraceMarkerRecord marker{.code = code};
+        const platform::EmittedEvent event{.code = code};
         std::memcpy(page.data() + place, &head, sizeof head);
         std::memcpy(page.data() + place + 4, &markerType, sizeof markerType);
-        std::memcpy(page.data() + place + 12, &marker, sizeof marker);
+        std::memcpy(page.data() + place + 12, &event, sizeof event);
         ++events;
     }
     const std::uint64_t commit = place - headSize;
@@ -98,7 +98,7 @@ void measureMerging(const Options& options, Report& report)
 // A minimal service for a client that emits: it sends the marker over a socket of its own.
 class HandingService final : public platform::ConnectionListenerDelegate {
 public:
-    explicit HandingService(platform::TraceMarkerAccess& access)
+    explicit HandingService(platform::EmitterAccess& access)
     {
         auto socket = platform::ListeningSocket::bind(path());
         auto listener = socket ? platform::LinuxConnectionListener::create(*std::move(socket), category_)
@@ -107,7 +107,7 @@ public:
             throw std::runtime_error("no service can listen");
         listener_ = *std::move(listener);
         listener_->setDelegate(*this);
-        listener_->setTraceAccess(access);
+        listener_->setEmitterAccess(access);
         thread_ = std::thread([this] { listener_->resume(); });
     }
     ~HandingService() override
@@ -159,11 +159,11 @@ public:
     void setTracing(bool isTracing)
     {
         access_.setTracing(isTracing);
-        markers_.setMarker(isTracing ? marker_ : -1);
+        emitter_.setMarker(isTracing ? marker_ : -1);
     }
     double costOfWriting(std::size_t count)
     {
-        const platform::TraceMarkerRecord record{.code = code};
+        const platform::EmittedEvent record{.code = code};
         return nanosecondsEach(count, [&](std::size_t) {
             [[maybe_unused]] const ssize_t written = ::write(marker_, &record, sizeof record);
         });
@@ -175,14 +175,14 @@ public:
     }
     double costOfService(std::size_t count)
     {
-        platform::TraceMarkers& markers = markers_;
-        return nanosecondsEach(count, [&](std::size_t number) { markers.emit(code, {number}); });
+        platform::TraceEmitter& emitter = emitter_;
+        return nanosecondsEach(count, [&](std::size_t number) { emitter.emit(code, {number}); });
     }
 
 private:
     const int marker_;
-    platform::TraceMarkerAccess access_;
-    platform::TracefsMarkers markers_;
+    platform::EmitterAccess access_;
+    platform::TracefsEmitter emitter_;
     const HandingService service_{access_};
     kesto::Client client_;
 };

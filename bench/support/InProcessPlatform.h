@@ -26,7 +26,7 @@ public:
                            .processTable = processTable_,
                            .notifications = notifications_,
                            .analytics = analytics_,
-                           .traceMarkers = traceMarkers_,
+                           .traceEmitter = traceEmitter_,
                            .reportingChannels = reportingChannels_,
                            .bugCapture = bugCapture_,
                            .kernelTrace = kernelTrace_,
@@ -134,7 +134,7 @@ private:
         void sendAnalyticsEventLazy(platform::Turn&, std::string_view, PayloadBuilder) override { }
         void sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view, PayloadBuilder) override { }
     };
-    class TraceMarkers final : public platform::TraceMarkers {
+    class TraceEmitter final : public platform::TraceEmitter {
         void emit(std::uint32_t, const std::array<std::uint64_t, 4>&) override { }
     };
     class ReportingChannels final : public platform::ReportingChannels {
@@ -215,7 +215,7 @@ private:
     ProcessTable processTable_;
     Notifications notifications_;
     Analytics analytics_;
-    TraceMarkers traceMarkers_;
+    TraceEmitter traceEmitter_;
     ReportingChannels reportingChannels_;
     BugCapture bugCapture_;
     KernelTrace kernelTrace_;

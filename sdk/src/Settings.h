@@ -1,7 +1,7 @@
 // A client's options with their defaults filled in.
 #pragma once
 
-#include "Tracer.h"
+#include "AttachableEmitter.h"
 #include "kesto/kesto.h"
 
 #include <chrono>
@@ -56,7 +56,7 @@ struct Settings {
     std::chrono::milliseconds firstRetry;
     std::chrono::milliseconds longestRetry;
     StateListener stateChanged;
-    std::unique_ptr<Tracer> tracer; // null: the client emits no trace events
+    std::unique_ptr<AttachableEmitter> emitter; // null: the client emits no trace events
 };
 
 } // namespace libkesto

@@ -18,7 +18,7 @@
 #include "platform/Preferences.h"
 #include "platform/ProcessTable.h"
 #include "platform/ReportingChannels.h"
-#include "platform/TraceMarkers.h"
+#include "platform/TraceEmitter.h"
 #include "platform/WorkQueue.h"
 
 namespace platform {
@@ -34,7 +34,7 @@ struct Platform {
     ProcessTable& processTable;
     Notifications& notifications;
     Analytics& analytics;
-    TraceMarkers& traceMarkers;
+    TraceEmitter& traceEmitter;
     ReportingChannels& reportingChannels;
     BugCapture& bugCapture;
     KernelTrace& kernelTrace;

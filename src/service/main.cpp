@@ -54,7 +54,7 @@ int run()
     platform::LinuxPlatform platform(*launch);
     platform::install(platform.platform());
     platform.removeUnfinished(KestoReportingTracingLogsDirectory());
-    (*listener)->setTraceAccess(platform.traceMarkerAccess());
+    (*listener)->setEmitterAccess(platform.emitterAccess());
     const auto service = KestoReportingServiceDelegate::make();
     (*listener)->setDelegate(*service);
     (*listener)->setListeningHandler([] { platform::notifyReady("accepting connections"); });

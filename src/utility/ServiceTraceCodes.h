@@ -1,4 +1,4 @@
-// The codes of the service's own markers in the kernel's trace, which show its work between the events of drivers and
+// The codes of the service's own events in the kernel's trace, which show its work between the events of drivers and
 // clients.
 #pragma once
 
@@ -23,10 +23,10 @@ enum class ServiceTraceCode : std::uint32_t {
     SessionMessageAccepted = 0x21044838,
 };
 
-// Emits the marker, with four zero arguments. Any thread.
+// Emits an event of that code, with four zero arguments. Any thread.
 inline void emitTraceCode(ServiceTraceCode code)
 {
-    platform::current().traceMarkers.emit(static_cast<std::uint32_t>(code), {});
+    platform::current().traceEmitter.emit(static_cast<std::uint32_t>(code), {});
 }
 
 } // namespace utility

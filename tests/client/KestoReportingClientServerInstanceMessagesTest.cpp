@@ -74,7 +74,7 @@ TEST_F(MessagesTest, ReachTheSessionTheyAreFor)
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Debug, "kerc", "sending message for reporter [42]"),
                             IsLine(Debug, "kerr", "sending message for session owned by 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage, sessionMessageAccepted));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientSendMessage, sessionMessageAccepted));
     EXPECT_THAT(platform.analytics.sent(),
                 ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.generic.Playback.Start"));
 }
@@ -127,7 +127,7 @@ TEST_F(MessagesTest, SkipZeroAndIDsThatNobodyHas)
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Debug, "kerc", "sending message for reporter [0,99]"),
                             IsLine(Error, "kers", "failed to find reporting session 99")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientSendMessage));
     EXPECT_EQ(send(player, Array{0, 42, 99}), answeredOnce(delivered));
     EXPECT_NE(recorded(player, 42), std::nullopt);
 }
@@ -246,7 +246,7 @@ TEST_F(MessagesTest, WithoutAListAndAnyStartedSessionAreDeliveredOnceThroughASta
                             IsLine(Info, "kerr", "created reporting session for ID: 1"),
                             IsLine(Info, "kerr", "setting service type standalone"),
                             IsLine(Debug, "kerr", "sending message for session owned by 1")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage, sessionCreated, sessionMessageAccepted));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientSendMessage, sessionCreated, sessionMessageAccepted));
     EXPECT_THAT(platform.analytics.events(),
                 ElementsAre(AnalyticsEvent{"com.quarn.kesto.Playback.Start",
                                            {{"a", 1}, {"HostApplicationDisplayID", "Unknown"}}},
@@ -261,7 +261,7 @@ TEST_F(MessagesTest, LetGoOfTheStandaloneSession)
     EXPECT_EQ(player.call(GetAllReporters), answeredOnce({null, Array{}}));
     platform.analytics.clear(); // which held it for a payload to come
     EXPECT_EQ(platform.log.lines().back().message, "deallocing this session 1");
-    EXPECT_EQ(platform.traceMarkers.take().back(), sessionDestroyed);
+    EXPECT_EQ(platform.traceEmitter.take().back(), sessionDestroyed);
 }
 
 // --- order
@@ -375,7 +375,7 @@ TEST_F(ClientAndServiceTest, AnswersAMessageWithAnErrorAndDeliversNothingWhenRep
     platform.analytics.use("*");
     createSession(42);
     platform.log.clear();
-    platform.traceMarkers.take();
+    platform.traceEmitter.take();
     EXPECT_CALL(*service, isReportingEnabled).WillRepeatedly(Return(false));
     EXPECT_CALL(*service, handleEventForVorp).Times(0);
     EXPECT_CALL(*service, getAllActiveReportingSessions).Times(0);
@@ -387,7 +387,7 @@ TEST_F(ClientAndServiceTest, AnswersAMessageWithAnErrorAndDeliversNothingWhenRep
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Debug, "kerc", "sending message for reporter [42]"),
                             IsLine(Debug, "kerc", "sending message for reporter (null)")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientSendMessage, clientSendMessage));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientSendMessage, clientSendMessage));
 }
 
 TEST_F(ClientAndServiceTest, HandsTheMessageItsSessionAndTheSendersNameToTheBugCaptureManager)

@@ -94,11 +94,11 @@ TEST_F(ClientTest, DoesNothingOnTheCallersThreadButSubmit)
         const auto call = player.submit(method, arguments);
         EXPECT_EQ(platform.workQueues.pending(), 1U);
         EXPECT_THAT(lines(), IsEmpty());
-        EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+        EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
         EXPECT_THAT(player.answersTo(call), IsEmpty());
         platform.workQueues.runAll();
         platform.log.clear();
-        platform.traceMarkers.take();
+        platform.traceEmitter.take();
     }
 }
 
@@ -137,7 +137,7 @@ TEST_F(ClientTest, SaysWhatIsCalledBeforeItMarksIt)
           "deallocing this session 42", "destroying 42"}}};
     std::vector<std::string> steps;
     platform.log.setObserver([&](const LogLine& line) { steps.push_back(line.message); });
-    platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
+    platform.traceEmitter.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
     for (const auto& [method, arguments, firstSteps] : rows) {
         steps.clear();
         player.submit(method, arguments);
@@ -147,7 +147,7 @@ TEST_F(ClientTest, SaysWhatIsCalledBeforeItMarksIt)
         EXPECT_EQ(steps, firstSteps);
     }
     platform.log.setObserver(nullptr);
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
 }
 
 // --- create
@@ -163,7 +163,7 @@ TEST_F(ClientTest, CreatesASessionOwnedByItsProcess)
                 ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 42"),
                             IsLine(Info, "kerr", "created reporting session for ID: 42"),
                             IsLine(Default, "kerc", "session created for reporter 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientCreate, sessionCreated));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientCreate, sessionCreated));
 }
 
 TEST_F(ClientTest, ReplacesASessionOfTheSameIDWithoutStoppingOrReportingIt)
@@ -183,7 +183,7 @@ TEST_F(ClientTest, ReplacesASessionOfTheSameIDWithoutStoppingOrReportingIt)
                             IsLine(Info, "kerr", "created reporting session for ID: 42"),
                             IsLine(Info, "kerr", "deallocing this session 42"),
                             IsLine(Default, "kerc", "session created for reporter 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientCreate, sessionCreated, sessionDestroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientCreate, sessionCreated, sessionDestroyed));
     EXPECT_THAT(platform.analytics.sent(), IsEmpty());
 }
 
@@ -246,7 +246,7 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanAllClientsMayHaveTogether)
             clients.back()->createReportingSession(static_cast<std::int64_t>(index), [](auto&, const auto&, bool) { });
         platform.workQueues.runAll();
         platform.log.clear();
-        platform.traceMarkers.take();
+        platform.traceEmitter.take();
         sessions += clients.back()->clientReportingSessionMap().size();
     };
     while (clients.size() < most / KestoReportingClientServerInstance::mostSessions)
@@ -275,7 +275,7 @@ TEST_F(ClientTest, SetsAServiceType)
                 ElementsAre(IsLine(Debug, "kerc", "setting service type 4 for reporter 42"),
                             IsLine(Info, "kerr", "setting service type alarms"),
                             IsLine(Default, "kerc", "service type 4 set for reporter  42")));
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 TEST_F(ClientTest, SetsNoServiceTypeOfASessionThatItDoesNotHave)
@@ -307,7 +307,7 @@ TEST_F(ClientTest, TellsTheServiceTypeOfItsOwnSession)
     EXPECT_THAT(lines(),
                 ElementsAre(IsLine(Debug, "kerc", "fetching seviceType"),
                             IsLine(Default, "kerc", "returning service type 4 for reporter  42")));
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 TEST_F(ClientTest, TellsTheServiceTypeOfAnotherClientsSession)
@@ -368,7 +368,7 @@ TEST_F(ClientTest, MergesAConfiguration)
     EXPECT_THAT(
         lines(),
         ElementsAre(IsLine(Debug, "kerc", "setting configuration"), IsLine(Debug, "kerc", "setting configuration")));
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 TEST_F(ClientTest, ConfiguresSessionZero)
@@ -412,7 +412,7 @@ TEST_F(ClientTest, StartsASessionAndHoldsTheAnswer)
                             IsLine(Default, "kers", "sessions for client 1001 : [" + described(42, true) + "]"),
                             IsLine(Default, "kers", "sessions for client 1002 : []"),
                             IsLine(Default, "kerc", "0 active reporting session(s) [" + described(42, true) + "]")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart, sessionStarted));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStart, sessionStarted));
 }
 
 TEST_F(ClientTest, AnswersAStartOfASessionThatIsStartedAtOnce)
@@ -425,7 +425,7 @@ TEST_F(ClientTest, AnswersAStartOfASessionThatIsStartedAtOnce)
     EXPECT_EQ(start(42), answeredOnce(succeeded));
     EXPECT_EQ(player.answersTo(first), unanswered);
     EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "starting session for reporter 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStart));
 
     stop(42);
     EXPECT_EQ(player.answersTo(first), answeredOnce(succeeded)) << "the stored callback was not replaced";
@@ -444,7 +444,7 @@ TEST_F(ClientTest, StartsNeitherSessionZeroNorOneThatItDoesNotHave)
                 ElementsAre(IsLine(Debug, "kerc", "starting session for reporter 0"),
                             IsLine(Debug, "kerc", "starting session for reporter 43"),
                             IsLine(Debug, "kerc", "starting session for reporter 44")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart, clientStart, clientStart));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStart, clientStart, clientStart));
 }
 
 TEST_F(ClientTest, AnswersTheFirstOfTwoStartsAtTheStopBetweenThem)
@@ -490,7 +490,7 @@ TEST_F(ClientTest, TellsAStartedSessionTheFeatureState)
     const auto payload = messages[0].find("Setup_Setup_1")->dictionary();
     EXPECT_EQ(*payload->find("device_name"), Value("Speaker"));
     EXPECT_EQ(*payload->find("audiotag"), Value("SetupSetup"));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStart, sessionStarted, sessionMessageAccepted));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStart, sessionStarted, sessionMessageAccepted));
 }
 
 TEST_F(ClientTest, TellsAStartedSessionNothingWhenNoFeatureIsKnown)
@@ -531,7 +531,7 @@ TEST_F(TracedStartTest, IsAnsweredAtOnceBetweenTheFeatureMessageAndTheActiveSess
     const auto note = [&](const std::string& step) {
         steps.push_back(step + ", answers: " + std::to_string(player.connection().sent() - before));
     };
-    platform.traceMarkers.setObserver([&](std::uint32_t code) {
+    platform.traceEmitter.setObserver([&](std::uint32_t code) {
         if (code == sessionMessageAccepted)
             note("features told");
     });
@@ -540,7 +540,7 @@ TEST_F(TracedStartTest, IsAnsweredAtOnceBetweenTheFeatureMessageAndTheActiveSess
             note("active sessions said");
     });
     platform.workQueues.runAll();
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
     platform.log.setObserver(nullptr);
     EXPECT_THAT(steps, ElementsAre("features told, answers: 0", "active sessions said, answers: 1"));
 }
@@ -589,7 +589,7 @@ TEST_F(ClientTest, StopsASessionAndAnswersItsStart)
                             IsLine(Default, "kers", "sessions for client 1002 : []"),
                             IsLine(Default, "kerc", "0 active reporting session(s) []"),
                             IsLine(Default, "kerc", "stopping 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStop, sessionStopping));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStop, sessionStopping));
 }
 
 TEST_F(ClientTest, LetsGoOfTheDriversSnapshotBeforeItStopsASession)
@@ -615,7 +615,7 @@ TEST_F(ClientTest, AnswersTheStopOfASessionThatIsNotStarted)
     EXPECT_THAT(
         lines(),
         ElementsAre(IsLine(Debug, "kerc", "stopping session for reporter 42"), IsLine(Default, "kerc", "stopping 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStop));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStop));
 }
 
 TEST_F(ClientTest, StopsNoSessionThatItDoesNotHave)
@@ -638,7 +638,7 @@ TEST_F(ClientTest, AnswersTheStopOfSessionZeroWithoutAnotherWord)
     EXPECT_EQ(stop(0), answeredOnce(succeeded));
     EXPECT_TRUE(player.session(0)->started());
     EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "stopping session for reporter 0")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientStop));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStop));
 }
 
 // --- destroy
@@ -658,7 +658,7 @@ TEST_F(ClientTest, DestroysAStartedSessionWithoutAnsweringItsStart)
                             IsLine(Debug, "kerr", "ending session 42"), IsLine(Debug, "kerr", "ending session 42"),
                             IsLine(Info, "kerr", "deallocing this session 42"),
                             IsLine(Default, "kerc", "destroying 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientDestroy, sessionStopping, sessionDestroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientDestroy, sessionStopping, sessionDestroyed));
 }
 
 TEST_F(ClientTest, DestroysASessionThatIsNotStartedWithoutStoppingIt)
@@ -671,7 +671,7 @@ TEST_F(ClientTest, DestroysASessionThatIsNotStartedWithoutStoppingIt)
                 ElementsAre(IsLine(Debug, "kerc", "destroying session for reporter 42"),
                             IsLine(Info, "kerr", "deallocing this session 42"),
                             IsLine(Default, "kerc", "destroying 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientDestroy, sessionDestroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientDestroy, sessionDestroyed));
 }
 
 TEST_F(ClientTest, DestroysNoSessionThatItDoesNotHave)
@@ -692,7 +692,7 @@ TEST_F(ClientTest, DestroysSessionZeroNeither)
     EXPECT_EQ(player.call(DestroyReportingSession, 0), answeredOnce(succeeded));
     EXPECT_NE(player.session(0), nullptr);
     EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "destroying session for reporter 0")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(clientDestroy));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientDestroy));
 }
 
 // --- validate and list
@@ -713,7 +713,7 @@ TEST_F(ClientTest, ValidatesASessionOfAnyClient)
                 ElementsAre(IsLine(Debug, "kerc", "validating reporter 42"),
                             IsLine(Info, "kers", "found reporting session 42 for client 1001"),
                             IsLine(Default, "kerc", "validating reporter 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 TEST_F(ClientTest, ValidatesNoSessionThatNobodyHas)
@@ -741,7 +741,7 @@ TEST_F(ClientTest, ListsTheReportersOfAllClientsInOrder)
     harness.forget();
     EXPECT_EQ(recorder.call(GetAllReporters), answeredOnce({null, Array{9, 5, 0, 5, -3}}));
     EXPECT_THAT(lines(), IsEmpty());
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 TEST_F(ClientTest, ListsNothingForWhoIsGone)
@@ -826,7 +826,7 @@ TEST_F(ClientTest, StopsItsStartedSessionsInOrderAndLeavesWhenTheConnectionIsLos
                             IsLine(Info, "kerr", "deallocing this session 1"),
                             IsLine(Info, "kerr", "deallocing this session 2"),
                             IsLine(Default, "kerc", "removing 1001 from the server client list")));
-    EXPECT_THAT(platform.traceMarkers.take(),
+    EXPECT_THAT(platform.traceEmitter.take(),
                 ElementsAre(sessionStopping, sessionStopping, sessionDestroyed, sessionDestroyed, sessionDestroyed));
 }
 

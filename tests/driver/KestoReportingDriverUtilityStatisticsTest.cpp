@@ -321,10 +321,10 @@ TEST_F(DriverLogs, TellTheSessionFirstAndThenTheAnalyticsBridge)
     begin();
     publish(simple(15));
     std::vector<std::string> steps;
-    platform.traceMarkers.setObserver([&](std::uint32_t) { steps.emplace_back("session"); });
+    platform.traceEmitter.setObserver([&](std::uint32_t) { steps.emplace_back("session"); });
     platform.analytics.setObserver([&](const std::string& name) { steps.push_back(name); });
     end();
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
     platform.analytics.setObserver(nullptr);
     EXPECT_THAT(steps,
                 ElementsAre("session", "com.quarn.kesto.Cavlet.Simple", "com.quarn.longformaudio.Cavlet.Simple",

@@ -1,8 +1,8 @@
 // Emitting trace events while a client connects, gets the marker, and loses its connection again. The marker is a pipe,
 // the page the service's own.
 #include "kesto/trace.hpp"
-#include "platform/linux/trace/TraceMarker.h"
-#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/EmitterAccess.h"
+#include "platform/linux/trace/EmitterInterface.h"
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"
@@ -26,9 +26,9 @@ using foundation::Array;
 using foundation::Value;
 using kesto::State;
 using kesto::Status;
+using platform::EmittedEvent;
 using platform::FileDescriptor;
-using platform::TraceMarkerPage;
-using platform::TraceMarkerRecord;
+using platform::TraceSwitchPage;
 using sdk_test::FakeService;
 using sdk_test::patience;
 using sdk_test::Peer;
@@ -44,7 +44,7 @@ protected:
         out = FileDescriptor(ends[0]);
         in = FileDescriptor(ends[1]);
         EXPECT_FALSE(access.open(in.get()));
-        access.ask(this, [this](const platform::TraceDescriptors& handedOut) { descriptors = handedOut; });
+        access.ask(this, [this](const platform::EmitterDescriptors& handedOut) { descriptors = handedOut; });
     }
 
     static bool isRequest(const Array& call) { return call.size() == 2 && call[1].string().has_value(); }
@@ -82,18 +82,18 @@ protected:
         return result;
     }
     // The complete records that were written to the marker.
-    std::vector<TraceMarkerRecord> records()
+    std::vector<EmittedEvent> records()
     {
-        std::vector<TraceMarkerRecord> records(1000);
-        const ssize_t size = ::read(out.get(), records.data(), records.size() * sizeof(TraceMarkerRecord));
-        EXPECT_EQ(size < 0 ? 0 : size % static_cast<ssize_t>(sizeof(TraceMarkerRecord)), 0);
-        records.resize(size < 0 ? 0 : static_cast<std::size_t>(size) / sizeof(TraceMarkerRecord));
+        std::vector<EmittedEvent> records(1000);
+        const ssize_t size = ::read(out.get(), records.data(), records.size() * sizeof(EmittedEvent));
+        EXPECT_EQ(size < 0 ? 0 : size % static_cast<ssize_t>(sizeof(EmittedEvent)), 0);
+        records.resize(size < 0 ? 0 : static_cast<std::size_t>(size) / sizeof(EmittedEvent));
         return records;
     }
     std::vector<std::uint32_t> codes()
     {
         std::vector<std::uint32_t> codes;
-        for (const TraceMarkerRecord& record : records())
+        for (const EmittedEvent& record : records())
             codes.push_back(record.code);
         return codes;
     }
@@ -105,8 +105,8 @@ protected:
 
     FileDescriptor out;
     FileDescriptor in;
-    platform::TraceMarkerAccess access;
-    platform::TraceDescriptors descriptors;
+    platform::EmitterAccess access;
+    platform::EmitterDescriptors descriptors;
     std::vector<int> attached;
     std::atomic<int> requests = 0;
     support::TemporaryDirectory directory;
@@ -131,7 +131,7 @@ TEST_F(TracerTest, EmitsWhileATraceRuns)
     tracer.emit(3);
     const auto emitted = records();
     ASSERT_EQ(emitted.size(), 1U);
-    EXPECT_EQ(emitted[0].tag, TraceMarkerRecord::ownTag);
+    EXPECT_EQ(emitted[0].tag, EmittedEvent::ownTag);
     EXPECT_EQ(emitted[0].code, 2U);
     EXPECT_THAT(emitted[0].arguments, ElementsAre(1U, 2U, 3U, UINT64_MAX));
 }
@@ -221,8 +221,8 @@ TEST_F(TracerTest, MayBeUsedByThreadsWhileConnectionsComeAndGo)
     for (std::thread& thread : threads)
         thread.join();
     EXPECT_TRUE(isAlwaysReached);
-    for (const TraceMarkerRecord& record : records())
-        EXPECT_EQ(record.tag, TraceMarkerRecord::ownTag) << "nothing is torn";
+    for (const EmittedEvent& record : records())
+        EXPECT_EQ(record.tag, EmittedEvent::ownTag) << "nothing is torn";
 }
 
 TEST_F(TracerTest, StaysSilentWithoutDescriptors)
@@ -241,7 +241,7 @@ TEST_F(TracerTest, StaysSilentWithoutDescriptors)
 TEST_F(TracerTest, TakesNoPageThatCouldGoAway)
 {
     const FileDescriptor unsealed(::memfd_create("page", MFD_CLOEXEC | MFD_ALLOW_SEALING));
-    ASSERT_EQ(::ftruncate(unsealed.get(), TraceMarkerPage::size), 0);
+    ASSERT_EQ(::ftruncate(unsealed.get(), TraceSwitchPage::size), 0);
     const FileDescriptor small(::memfd_create("page", MFD_CLOEXEC | MFD_ALLOW_SEALING));
     ASSERT_EQ(::ftruncate(small.get(), 16), 0);
     ASSERT_EQ(::fcntl(small.get(), F_ADD_SEALS, F_SEAL_SHRINK), 0);

@@ -37,7 +37,7 @@ protected:
         platform.deviceProperties.setInternalBuild(isInternal);
         session->start();
         platform.log.clear();
-        platform.traceMarkers.take();
+        platform.traceEmitter.take();
     }
 
     void send(const std::optional<Dictionary>& message, AudioEventCategory category = playback,
@@ -266,12 +266,12 @@ TEST_F(SessionMessagesTest, ToASessionThatIsNotStartedAreNotRecorded)
 {
     session->stop(platform.turn);
     platform.log.clear();
-    platform.traceMarkers.take();
+    platform.traceEmitter.take();
     send(Dictionary{{"a", 1}});
     EXPECT_FALSE(session->createMessageIdentifier(playback, start, {{"a", 1}}));
     EXPECT_EQ(session->nestedAggregatedPayloadData(), std::nullopt);
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "sending message for session owned by 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(acceptedMarker));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(acceptedMarker));
 }
 
 // --- markers and replies
@@ -280,7 +280,7 @@ TEST_F(SessionMessagesTest, LeaveAMarkerEachRecordedOrNot)
 {
     send(Dictionary{{"a", 1}});
     send(Dictionary{{"a", 1}});
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(acceptedMarker, acceptedMarker));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(acceptedMarker, acceptedMarker));
 }
 
 TEST_F(SessionMessagesTest, AreAnsweredBeforeTheCallReturnsWithNoErrorWhateverBecomesOfThem)
@@ -288,14 +288,14 @@ TEST_F(SessionMessagesTest, AreAnsweredBeforeTheCallReturnsWithNoErrorWhateverBe
     int replies = 0;
     const auto reply = [&](const std::optional<utility::ReplyError>& error) {
         EXPECT_EQ(error, std::nullopt);
-        EXPECT_THAT(platform.traceMarkers.take(), SizeIs(1)) << "the reply comes after the marker";
+        EXPECT_THAT(platform.traceEmitter.take(), SizeIs(1)) << "the reply comes after the marker";
         ++replies;
     };
     for (const bool sync : {true, false})
         session->sendMessage(Dictionary{{"a", 1}}, playback, start, sync, reply);
     session->sendMessage(Dictionary{{"a", 1}}, playback, start, reply);
     session->stop(platform.turn);
-    platform.traceMarkers.take();
+    platform.traceEmitter.take();
     session->sendMessage(Dictionary{{"a", 1}}, playback, start, reply);
     EXPECT_EQ(replies, 4);
 }
@@ -401,7 +401,7 @@ TEST_F(SingleMessageTest, DoesNothingASecondLaterOnTheBackgroundQueue)
     EXPECT_THAT(platform.workQueues.delayed(), IsEmpty());
     EXPECT_THAT(platform.log.lines(), IsEmpty());
     EXPECT_THAT(platform.analytics.asked(), IsEmpty());
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 } // namespace

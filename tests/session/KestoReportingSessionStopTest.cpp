@@ -62,14 +62,14 @@ protected:
         });
         platform.analytics.setObserver(
             [&](const std::string& name) { steps.push_back(name + " after " + identifiers().back()); });
-        platform.traceMarkers.setObserver([&](std::uint32_t code) {
+        platform.traceEmitter.setObserver([&](std::uint32_t code) {
             if (code == accepted)
                 steps.push_back("recorded " + identifiers().back());
         });
         session->stop(platform.turn);
         platform.log.setObserver(nullptr);
         platform.analytics.setObserver(nullptr);
-        platform.traceMarkers.setObserver(nullptr);
+        platform.traceEmitter.setObserver(nullptr);
         return steps;
     }
 
@@ -106,11 +106,11 @@ TEST_F(SessionStop, CountsAsStartedUntilItIsOver)
     std::vector<bool> started;
     platform.log.setObserver([&](const support::LogLine&) { started.push_back(session->started()); });
     platform.analytics.setObserver([&](const std::string&) { started.push_back(session->started()); });
-    platform.traceMarkers.setObserver([&](std::uint32_t) { started.push_back(session->started()); });
+    platform.traceEmitter.setObserver([&](std::uint32_t) { started.push_back(session->started()); });
     session->stop(platform.turn);
     platform.log.setObserver(nullptr);
     platform.analytics.setObserver(nullptr);
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
     EXPECT_THAT(started, SizeIs(testing::Ge(12U)));
     EXPECT_THAT(started, testing::Each(true));
     EXPECT_FALSE(session->started());
@@ -140,9 +140,9 @@ TEST_F(SessionStop, SaysWhatItDoesAtItsLevel)
 TEST_F(SessionStop, MarksItsMomentsForTheKernelTrace)
 {
     play();
-    platform.traceMarkers.take();
+    platform.traceEmitter.take();
     session->stop(platform.turn);
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(stopping, accepted, accepted, accepted));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(stopping, accepted, accepted, accepted));
 }
 
 TEST_F(SessionStop, HandsVolumeEventsToTheBridgeAsTheyWereMade)
@@ -175,14 +175,14 @@ TEST_F(SessionStop, PutsVolumeEventsIntoTheSummaryUnderItsOwnTag)
 {
     play();
     Dictionary summary;
-    platform.traceMarkers.setObserver(
+    platform.traceEmitter.setObserver(
         [&](std::uint32_t) { summary = *session->nestedAggregatedPayloadData()->back().begin()->value.dictionary(); });
     session->stop(platform.turn);
     EXPECT_EQ(summary.find("play_seconds")->text(), "30,70");
     EXPECT_EQ(summary.find("PomoSessionVolume")->text(), "0.5,0.75,0.5,0.75");
     EXPECT_EQ(summary.find("KESTO_Session_Summary_Event")->text(), "7");
     EXPECT_EQ(summary.find("audiotag")->text(), "UndefinedUnknown");
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
 }
 
 TEST_F(SessionStop, RecordsNoVolumeEventThatRepeatsTheOneBeforeButHandsItToTheBridge)

@@ -153,7 +153,7 @@ TEST(SummaryOnCustomerBuilds, IsMadeAndRecordedWithoutTimeStamps)
     session->start();
     session->sendMessage(Dictionary{{"a", 1}, {"kestoreporting_timestamp", 12.5}}, playback, 1, nullptr);
     std::vector<std::string> recorded;
-    platform.traceMarkers.setObserver(
+    platform.traceEmitter.setObserver(
         [&](std::uint32_t) { recorded = textsOf(*session->nestedAggregatedPayloadData()); });
     session->stop(platform.turn);
     EXPECT_THAT(recorded,
@@ -161,7 +161,7 @@ TEST(SummaryOnCustomerBuilds, IsMadeAndRecordedWithoutTimeStamps)
                                      R"({"Undefined_Unknown_1":{"KESTO_Session_Summary_Event":"0","a":"1",)"
                                      R"("audiotag":"UndefinedUnknown"}})"));
     EXPECT_TRUE(platform.fileSystem.files.empty());
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
 }
 
 // --- and what it costs

@@ -27,7 +27,7 @@ protected:
     void forget()
     {
         platform.log.clear();
-        platform.traceMarkers.take();
+        platform.traceEmitter.take();
     }
 
     support::TestPlatform platform;
@@ -56,7 +56,7 @@ TEST_F(SessionTest, SaysAndMarksThatItWasMade)
 {
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "created reporting session for ID: 42")));
     EXPECT_EQ(platform.log.lines()[0].name, "KestoReportingSession");
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(created));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(created));
 }
 
 TEST_F(SessionTest, SaysAndMarksThatItGoes)
@@ -64,17 +64,17 @@ TEST_F(SessionTest, SaysAndMarksThatItGoes)
     forget();
     session.reset();
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "deallocing this session 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(destroyed));
 }
 
 TEST_F(SessionTest, SaysThatItWasMadeBeforeItMarksItAndMarksThatItGoesBeforeItSaysIt)
 {
     std::vector<std::string> steps;
     platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
-    platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
+    platform.traceEmitter.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
     session = std::make_shared<KestoReportingSession>(43, std::vector<std::int32_t>{7}); // 42 goes
     platform.log.setObserver(nullptr);
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
     EXPECT_THAT(steps,
                 ElementsAre("created reporting session for ID: 43", std::to_string(created), std::to_string(destroyed),
                             "deallocing this session 42"));
@@ -86,7 +86,7 @@ TEST_F(SessionTest, GoesWithoutStoppingWhenItIsLetGoOfWhileStarted)
     forget();
     session.reset();
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "deallocing this session 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(destroyed));
 }
 
 TEST_F(SessionTest, TakesAnyNumberForItsIdentity)
@@ -171,7 +171,7 @@ TEST_F(SessionTest, TakesANameFromItsServiceTypeAndSaysSo)
     EXPECT_EQ(session->serviceType(), 3);
     EXPECT_EQ(session->serviceName(), "haptics");
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "setting service type haptics")));
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 TEST_F(SessionTest, KeepsTheNumberOfAServiceTypeItHasNoNameFor)
@@ -359,7 +359,7 @@ TEST_F(SessionTest, BeginsARunWithAnEmptyStore)
     EXPECT_THAT(*session->nestedAggregatedPayloadData(), IsEmpty());
     EXPECT_EQ(session->messageIdentifierCounts(), Dictionary());
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(started));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(started));
 }
 
 TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
@@ -368,14 +368,14 @@ TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
     session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
     session->stop(platform.turn);
     std::optional<std::size_t> messages;
-    platform.traceMarkers.setObserver([&](std::uint32_t code) {
+    platform.traceEmitter.setObserver([&](std::uint32_t code) {
         EXPECT_EQ(code, started);
         EXPECT_TRUE(session->started());
         if (const auto store = session->nestedAggregatedPayloadData())
             messages = store->size();
     });
     session->start();
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
     EXPECT_EQ(messages, 0U);
 }
 
@@ -391,7 +391,7 @@ TEST_F(SessionTest, StartedTwiceGoesOnAsItIs)
     EXPECT_THAT(platform.log.lines(),
                 ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42"),
                             IsLine(Info, "kerr", "42 is already started")));
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
 TEST_F(SessionTest, EndsARunAndDropsWhatItRecorded)
@@ -407,7 +407,7 @@ TEST_F(SessionTest, EndsARunAndDropsWhatItRecorded)
     ASSERT_THAT(lines, SizeIs(testing::Ge(2U)));
     EXPECT_THAT(lines[0], IsLine(Debug, "kerr", "ending session 42"));
     EXPECT_THAT(lines[1], IsLine(Debug, "kerr", "ending session 42"));
-    EXPECT_EQ(platform.traceMarkers.take().front(), stopping);
+    EXPECT_EQ(platform.traceEmitter.take().front(), stopping);
 }
 
 TEST_F(SessionTest, SaysTwiceThatItEndsBeforeItMarksIt)
@@ -415,10 +415,10 @@ TEST_F(SessionTest, SaysTwiceThatItEndsBeforeItMarksIt)
     session->start();
     std::vector<std::string> steps;
     platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
-    platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
+    platform.traceEmitter.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
     session->stop(platform.turn);
     platform.log.setObserver(nullptr);
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
     ASSERT_THAT(steps, SizeIs(testing::Ge(3U)));
     steps.resize(3);
     EXPECT_THAT(steps, ElementsAre("ending session 42", "ending session 42", std::to_string(stopping)));
@@ -436,7 +436,7 @@ TEST_F(SessionTest, StoppedWithoutAStartOnlySaysSo)
     session->stop(platform.turn);
     EXPECT_FALSE(session->started());
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "ending session 42")));
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
     EXPECT_THAT(platform.analytics.sent(), IsEmpty());
     EXPECT_THAT(platform.fileSystem.files, IsEmpty());
 }
@@ -459,11 +459,11 @@ TEST_F(SessionTest, MarksEveryPointOfItsLifeInOrder)
     session->setServiceType(4);
     session->start();
     session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(created, started, accepted));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(created, started, accepted));
     session->stop(platform.turn);
-    EXPECT_EQ(platform.traceMarkers.take().front(), stopping);
+    EXPECT_EQ(platform.traceEmitter.take().front(), stopping);
     session.reset();
-    EXPECT_THAT(platform.traceMarkers.take(), ElementsAre(destroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(destroyed));
 }
 
 class UntracedSessionTest : public SessionTest,

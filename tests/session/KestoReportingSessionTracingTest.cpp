@@ -42,7 +42,7 @@ protected:
         session->setServiceType(test);
         session->setConfiguration(Dictionary{{fileKey, file}});
         platform.log.clear();
-        platform.traceMarkers.take();
+        platform.traceEmitter.take();
     }
 
     // Emits an interval of that length.
@@ -139,10 +139,10 @@ TEST_F(SessionTracing, StartsWithTheSessionWhenAllConditionsHold)
 TEST_F(SessionTracing, StartsBehindTheMarkerOfTheSessionsStart)
 {
     std::vector<std::string> steps;
-    platform.traceMarkers.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
+    platform.traceEmitter.setObserver([&](std::uint32_t code) { steps.push_back(std::to_string(code)); });
     platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
     session->start();
-    platform.traceMarkers.setObserver(nullptr);
+    platform.traceEmitter.setObserver(nullptr);
     platform.log.setObserver(nullptr);
     EXPECT_THAT(steps,
                 ElementsAre("starting session owned by 42", std::to_string(0x2104482C),

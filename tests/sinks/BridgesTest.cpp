@@ -225,7 +225,7 @@ TEST_F(SilentSinksTest, AcceptEveryMessageAndDoNothing)
     EXPECT_THAT(platform.analytics.asked(), IsEmpty());
     EXPECT_THAT(platform.analytics.sent(), IsEmpty());
     EXPECT_THAT(platform.log.lines(), IsEmpty());
-    EXPECT_THAT(platform.traceMarkers.take(), IsEmpty());
+    EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
     EXPECT_EQ(session.use_count(), 1);
 }
 

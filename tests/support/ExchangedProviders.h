@@ -34,7 +34,7 @@ template <typename... Providers>
                                     .processTable = pick(platform.processTable),
                                     .notifications = pick(platform.notifications),
                                     .analytics = pick(platform.analytics),
-                                    .traceMarkers = pick(platform.traceMarkers),
+                                    .traceEmitter = pick(platform.traceEmitter),
                                     .reportingChannels = pick(platform.reportingChannels),
                                     .bugCapture = pick(platform.bugCapture),
                                     .kernelTrace = pick(platform.kernelTrace),

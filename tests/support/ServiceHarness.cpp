@@ -64,7 +64,7 @@ TestClient ServiceHarness::connect(std::string processName)
 void ServiceHarness::forget()
 {
     platform.log.clear();
-    platform.traceMarkers.take();
+    platform.traceEmitter.take();
 }
 
 } // namespace support

@@ -14,7 +14,7 @@ TestPlatform::TestPlatform()
                        .processTable = processTable,
                        .notifications = notifications,
                        .analytics = analytics,
-                       .traceMarkers = traceMarkers,
+                       .traceEmitter = traceEmitter,
                        .reportingChannels = reportingChannels,
                        .bugCapture = bugCapture,
                        .kernelTrace = kernelTrace,

@@ -12,7 +12,7 @@
 #include "support/fakes/FakeNotifications.h"
 #include "support/fakes/FakeReportingChannels.h"
 #include "support/fakes/FakeSettings.h"
-#include "support/fakes/FakeTraceMarkers.h"
+#include "support/fakes/FakeTraceEmitter.h"
 #include "support/fakes/FakeWorkQueues.h"
 
 namespace support {
@@ -35,7 +35,7 @@ public:
     FakeProcessTable processTable;
     FakeNotifications notifications;
     FakeAnalytics analytics;
-    FakeTraceMarkers traceMarkers;
+    FakeTraceEmitter traceEmitter;
     FakeReportingChannels reportingChannels;
     FakeBugCapture bugCapture;
     FakeKernelTrace kernelTrace;

@@ -67,7 +67,7 @@ kesto_options completed(const kesto_options* given) noexcept
 }
 
 libkesto::Settings settings(const kesto_options& options, std::vector<std::string> paths,
-                            libkesto::StateListener listener, std::unique_ptr<libkesto::Tracer> tracer)
+                            libkesto::StateListener listener, std::unique_ptr<libkesto::AttachableEmitter> emitter)
 {
     const std::size_t queueBytes =
         std::clamp(orDefault(options.queue_bytes, defaultQueueBytes), leastQueueBytes, mostQueueBytes);
@@ -81,7 +81,7 @@ libkesto::Settings settings(const kesto_options& options, std::vector<std::strin
             .longestRetry =
                 std::max(firstRetry, milliseconds(orDefault(options.longest_retry_ms, defaultLongestRetry))),
             .stateChanged = std::move(listener),
-            .tracer = std::move(tracer)};
+            .emitter = std::move(emitter)};
 }
 
 // ---- Operations ----
@@ -247,10 +247,10 @@ try {
     auto paths = libkesto::servicePaths(textOrEmpty(options.socket_path), textOrEmpty(options.service_name));
     if (!paths)
         return paths.error();
-    auto tracer = options.trace ? libkesto::Tracer::create() : nullptr;
-    if (options.trace && tracer == nullptr)
+    auto emitter = options.trace ? libkesto::AttachableEmitter::create() : nullptr;
+    if (options.trace && emitter == nullptr)
         return KESTO_SYSTEM_ERROR;
-    auto made = kesto_client::create(settings(options, *std::move(paths), std::move(listener), std::move(tracer)));
+    auto made = kesto_client::create(settings(options, *std::move(paths), std::move(listener), std::move(emitter)));
     if (made == nullptr)
         return KESTO_SYSTEM_ERROR;
     *client = made.get(); // before the first callback, which may use it

@@ -1,7 +1,7 @@
 // Implements trace.h with the classes of the library.
 #include "kesto/trace.h"
 
-#include "Tracer.h"
+#include "AttachableEmitter.h"
 #include "calls/Client.h"
 
 namespace {
@@ -21,5 +21,6 @@ void kesto_tracer_emit(const kesto_tracer* tracer, uint32_t code, uint64_t argum
                        uint64_t argument3, uint64_t argument4)
 {
     if (tracer != nullptr && tracer != &silentTracer)
-        static_cast<const libkesto::Tracer*>(tracer)->emit(code, {argument1, argument2, argument3, argument4});
+        static_cast<const libkesto::AttachableEmitter*>(tracer)->emit(code,
+                                                                      {argument1, argument2, argument3, argument4});
 }

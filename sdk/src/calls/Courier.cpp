@@ -70,7 +70,7 @@ void Courier::connect()
         return disconnect(opened.error());
     ++counters_.connections;
     retryPause_ = settings_.firstRetry;
-    if (settings_.tracer)
+    if (settings_.emitter)
         connection_.appendTraceRequest(traceRequest);
     changeState(KESTO_STATE_CONNECTED);
 }
@@ -78,8 +78,8 @@ void Courier::connect()
 void Courier::close() noexcept
 {
     connection_.close();
-    if (settings_.tracer)
-        settings_.tracer->detach(); // whatever a service said that is gone
+    if (settings_.emitter)
+        settings_.emitter->detach(); // whatever a service said that is gone
 }
 
 void Courier::disconnect(ConnectionFailure failure)
@@ -131,10 +131,10 @@ std::expected<std::size_t, ConnectionFailure> Courier::receive()
 
 bool Courier::take(const AnswerFrame& answer)
 {
-    if (answer.call != traceRequest || !settings_.tracer)
+    if (answer.call != traceRequest || !settings_.emitter)
         return calls_.answer(answer);
-    TraceDescriptors descriptors = connection_.takeDescriptors();
-    return !descriptors[0] || settings_.tracer->attach(std::move(descriptors)); // without any, nobody is to trace
+    ReceivedDescriptors descriptors = connection_.takeDescriptors();
+    return !descriptors[0] || settings_.emitter->attach(std::move(descriptors)); // without any, nobody is to trace
 }
 
 bool Courier::canTakeCalls() const noexcept

@@ -112,7 +112,7 @@ ssize_t ServiceConnection::receiveBytes()
 {
     if (!expectsDescriptors_)
         return ::recv(socket_.get(), received_.data(), received_.size(), MSG_DONTWAIT);
-    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int) * std::tuple_size_v<TraceDescriptors>)> control;
+    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int) * std::tuple_size_v<ReceivedDescriptors>)> control;
     iovec part = {received_.data(), received_.size()};
     msghdr message{};
     message.msg_iov = &part;
@@ -130,7 +130,7 @@ void ServiceConnection::keepDescriptors(const msghdr& message) noexcept
     const cmsghdr* const head = CMSG_FIRSTHDR(&message);
     if (head == nullptr || head->cmsg_level != SOL_SOCKET || head->cmsg_type != SCM_RIGHTS)
         return;
-    std::array<int, std::tuple_size_v<TraceDescriptors>> numbers{-1, -1};
+    std::array<int, std::tuple_size_v<ReceivedDescriptors>> numbers{-1, -1};
     std::memcpy(numbers.data(), CMSG_DATA(head), std::min(head->cmsg_len - CMSG_LEN(0), sizeof numbers));
     std::ranges::transform(numbers, descriptors_.begin(), [](int number) { return platform::FileDescriptor(number); });
 }

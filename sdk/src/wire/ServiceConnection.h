@@ -1,8 +1,8 @@
 // The socket to the service: connecting, and frames in both directions, without ever waiting for the peer.
 #pragma once
 
+#include "AttachableEmitter.h"
 #include "Counters.h"
-#include "Tracer.h"
 #include "platform/linux/connection/FrameReader.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "wire/Wire.h"
@@ -49,7 +49,7 @@ public:
     // The same with a request for what it takes to emit trace events; the answer's descriptors are then to be taken.
     void appendTraceRequest(std::uint64_t number);
     // Those that came last; none of them may be open.
-    [[nodiscard]] TraceDescriptors takeDescriptors() noexcept { return std::exchange(descriptors_, {}); }
+    [[nodiscard]] ReceivedDescriptors takeDescriptors() noexcept { return std::exchange(descriptors_, {}); }
     [[nodiscard]] std::size_t unsentBytes() const noexcept { return outbox_.size() - sentBytes_; }
 
     // Sends as much as the socket takes.
@@ -71,7 +71,7 @@ private:
     std::uint64_t streamPosition_ = 0; // of the outbox's beginning
     platform::FrameReader reader_;
     std::array<char, 16 * 1024> received_;
-    TraceDescriptors descriptors_;
+    ReceivedDescriptors descriptors_;
     bool expectsDescriptors_ = false;
     Counters& counters_;
 };

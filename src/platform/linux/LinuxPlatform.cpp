@@ -37,7 +37,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       reportingChannels_(launch.channelRoot, launch.soundRoot, ProviderLog(log_)),
       bugCapture_(launch.stateDirectory, {.log = log_.recentLines(), .clock = clock_, .workQueues = workQueues_},
                   ProviderLog(log_)),
-      kernelTrace_(TracefsPlace(), traceMarkers_, traceMarkerAccess_, ProviderLog(log_)),
+      kernelTrace_(TracefsPlace(), traceEmitter_, emitterAccess_, ProviderLog(log_)),
       performanceWriter_(fileSystem_, ProviderLog(log_)),
       analytics_(std::make_unique<EventWriter>(launch.stateDirectory, clock_, ProviderLog(log_)), configurationWatcher_,
                  clock_, ProviderLog(log_))
@@ -58,7 +58,7 @@ Platform LinuxPlatform::platform()
             .processTable = processTable_,
             .notifications = notifications_,
             .analytics = analytics_,
-            .traceMarkers = traceMarkers_,
+            .traceEmitter = traceEmitter_,
             .reportingChannels = reportingChannels_,
             .bugCapture = bugCapture_,
             .kernelTrace = kernelTrace_,

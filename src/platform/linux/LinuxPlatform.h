@@ -24,10 +24,10 @@
 #include "platform/linux/settings/LinuxNotifications.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "platform/linux/store/AnalyticsStore.h"
+#include "platform/linux/trace/EmitterAccess.h"
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
-#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/TracefsEmitter.h"
 #include "platform/linux/trace/TracefsKernelTrace.h"
-#include "platform/linux/trace/TracefsMarkers.h"
 
 namespace platform {
 
@@ -42,7 +42,7 @@ public:
     // For the start: see LinuxFileSystem.
     void removeUnfinished(const std::filesystem::path& folder) { fileSystem_.removeUnfinished(folder); }
     // The listener gives its descriptors to clients.
-    [[nodiscard]] TraceMarkerAccess& traceMarkerAccess() noexcept { return traceMarkerAccess_; }
+    [[nodiscard]] EmitterAccess& emitterAccess() noexcept { return emitterAccess_; }
 
 private:
     LinuxLog log_;
@@ -55,8 +55,8 @@ private:
     LinuxProcessTable processTable_;
     FolderKeeper folderKeeper_;
     LinuxFileSystem fileSystem_;
-    TracefsMarkers traceMarkers_;
-    TraceMarkerAccess traceMarkerAccess_;
+    TracefsEmitter traceEmitter_;
+    EmitterAccess emitterAccess_;
     LinuxReportingChannels reportingChannels_;
     LinuxBugCapture bugCapture_;
     TracefsKernelTrace kernelTrace_;

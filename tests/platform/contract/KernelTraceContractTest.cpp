@@ -5,8 +5,8 @@
 #include "platform/contract/Contract.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/trace/DeliveredEvents.h"
+#include "platform/linux/trace/ImitatedTracefs.h"
 #include "platform/linux/trace/RealTracefs.h"
-#include "platform/linux/trace/TracePages.h"
 #include "platform/linux/trace/TracefsKernelTrace.h"
 #include "support/fakes/FakeKernelTrace.h"
 #include "support/fakes/FakeLog.h"
@@ -79,7 +79,7 @@ class LinuxKernelTraceSubject : public KernelTraceSubject {
 public:
     explicit LinuxKernelTraceSubject(const platform::TracefsPlace& place)
         : mounts_(place.mounts),
-          trace_(place, markers_, access_, platform::ProviderLog(log_))
+          trace_(place, emitter_, access_, platform::ProviderLog(log_))
     {
     }
     [[nodiscard]] platform::KernelTrace& trace() override { return trace_; }
@@ -87,12 +87,12 @@ public:
     void takeTraceAway() override { support::writeFile(mounts_, ""); }
 
 protected:
-    platform::TracefsMarkers markers_;
+    platform::TracefsEmitter emitter_;
 
 private:
     const std::filesystem::path mounts_;
     support::FakeLog log_;
-    platform::TraceMarkerAccess access_;
+    platform::EmitterAccess access_;
     platform::LinuxWorkQueues queues_;
     platform::TracefsKernelTrace trace_;
 };
@@ -108,13 +108,13 @@ public:
     void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) override
     {
         const auto now = static_cast<std::uint64_t>(std::chrono::steady_clock::now().time_since_epoch().count());
-        tree.put(0, support::TracePageBuilder(now).event(now, code, 1, arguments).page());
+        tree.put(0, support::RingBufferPageBuilder(now).event(now, code, 1, arguments).page());
     }
     [[nodiscard]] bool refuseToStart() override { return std::filesystem::remove(tree.instance / "tracing_on"); }
     [[nodiscard]] bool lose(std::uint64_t count) override
     {
         const auto now = static_cast<std::uint64_t>(std::chrono::steady_clock::now().time_since_epoch().count());
-        tree.put(0, support::TracePageBuilder(now).event(now, 0xFFFFFFFF).missed(count).page());
+        tree.put(0, support::RingBufferPageBuilder(now).event(now, 0xFFFFFFFF).missed(count).page());
         return true;
     }
 };
@@ -132,7 +132,7 @@ public:
     [[nodiscard]] std::optional<std::string> absence() const override { return tracefs.problem(); }
     void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) override
     {
-        markers_.emit(code, arguments);
+        emitter_.emit(code, arguments);
     }
     [[nodiscard]] bool refuseToStart() override { return false; }
     [[nodiscard]] bool lose(std::uint64_t) override { return false; } // that would take a buffer full of them

@@ -14,7 +14,7 @@
 
 namespace platform {
 
-class TraceMarkerAccess;
+class EmitterAccess;
 
 // What happened since the listener was made. Any thread.
 struct ConnectionCounters {
@@ -32,7 +32,7 @@ struct ConnectionHub {
     FileDescriptor epoll; // watches the sockets; changed by any thread, waited for by the connection thread
     LogCategory& log;
     ConnectionCounters counters = {};
-    TraceMarkerAccess* traceAccess = nullptr; // null: nobody ever traces
+    EmitterAccess* emitterAccess = nullptr; // null: nobody ever traces
 
     std::thread::id connectionThread = {}; // from its start on
     [[nodiscard]] bool isConnectionThread() const { return connectionThread == std::this_thread::get_id(); }

@@ -12,7 +12,7 @@ namespace platform {
 namespace {
 
 // Sends what the socket takes, and the descriptors with the first byte.
-ssize_t sendWithDescriptors(int socket, std::string_view bytes, const TraceDescriptors& descriptors)
+ssize_t sendWithDescriptors(int socket, std::string_view bytes, const EmitterDescriptors& descriptors)
 {
     const std::array numbers{descriptors.marker, descriptors.page};
     alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof numbers)> control{};
@@ -40,7 +40,7 @@ void ConnectionOutput::append(std::string frames)
         bytes_ += frames;
 }
 
-void ConnectionOutput::append(std::string frame, const TraceDescriptors& descriptors)
+void ConnectionOutput::append(std::string frame, const EmitterDescriptors& descriptors)
 {
     handOver_ = {bytes_.size(), descriptors};
     append(std::move(frame));

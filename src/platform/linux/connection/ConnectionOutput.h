@@ -3,7 +3,7 @@
 // The connection keeps threads apart, and says when the socket may take more.
 #pragma once
 
-#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/EmitterAccess.h"
 
 #include <cstddef>
 #include <optional>
@@ -20,7 +20,7 @@ public:
     // Adds frames, with their heads, behind what waits already.
     void append(std::string frames);
     // The same of one frame that the descriptors go with. Once; they are valid until they were written or dropped.
-    void append(std::string frame, const TraceDescriptors& descriptors);
+    void append(std::string frame, const EmitterDescriptors& descriptors);
 
     // Gives the socket what it takes without waiting: how many bytes that were. Nothing, with `errno`, when the peer
     // takes nothing any more.
@@ -31,7 +31,7 @@ public:
 private:
     struct HandOver {
         std::size_t place; // in the bytes, where the frame begins that they go with
-        TraceDescriptors descriptors;
+        EmitterDescriptors descriptors;
     };
 
     [[nodiscard]] ssize_t sendTo(int socket);

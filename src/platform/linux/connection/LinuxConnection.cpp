@@ -195,16 +195,17 @@ std::expected<void, Connection::Violation> LinuxConnection::askForTraceMarker(co
         return std::unexpected(Violation{"a call's number is an unsigned 64-bit integer"});
     if (std::exchange(hasAskedForTraceMarker_, true))
         return std::unexpected(Violation{"it asks for the trace marker twice"});
-    if (hub_->traceAccess != nullptr)
-        hub_->traceAccess->ask(this, [weak = weak_from_this(), number = *number](const TraceDescriptors& descriptors) {
-            if (const auto self = weak.lock())
-                self->handOver(number, descriptors);
-        });
+    if (hub_->emitterAccess != nullptr)
+        hub_->emitterAccess->ask(this,
+                                 [weak = weak_from_this(), number = *number](const EmitterDescriptors& descriptors) {
+                                     if (const auto self = weak.lock())
+                                         self->handOver(number, descriptors);
+                                 });
     return {};
 }
 
 // Ahead of what a turn of the server queue holds back: nothing is kept for this answer.
-void LinuxConnection::handOver(std::uint64_t call, const TraceDescriptors& descriptors)
+void LinuxConnection::handOver(std::uint64_t call, const EmitterDescriptors& descriptors)
 {
     std::string frame;
     foundation::appendCborArrayHead(2, frame);
@@ -331,8 +332,8 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
             ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_DEL, socket_.get(), nullptr);
         socket_ = FileDescriptor();
     }
-    if (hasAskedForTraceMarker_ && hub_->traceAccess != nullptr)
-        hub_->traceAccess->forget(this);
+    if (hasAskedForTraceMarker_ && hub_->emitterAccess != nullptr)
+        hub_->emitterAccess->forget(this);
     if (readingPauses != 0 || droppedBytes_ != 0)
         KESTO_LOG(hub_->log, Default, "{} was behind: reading paused {} times, {} bytes of answers were dropped",
                   description(), readingPauses, droppedBytes_.load());

@@ -15,7 +15,7 @@
 #include "platform/linux/connection/ConnectionInput.h"
 #include "platform/linux/connection/ConnectionOutput.h"
 #include "platform/linux/files/FileDescriptor.h"
-#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/EmitterAccess.h"
 
 #include <atomic>
 #include <cstdint>
@@ -72,7 +72,7 @@ private:
     [[nodiscard]] std::expected<void, Violation> decodeFrames();
     [[nodiscard]] std::expected<void, Violation> deliverCalls();
     [[nodiscard]] std::expected<void, Violation> askForTraceMarker(const foundation::Value& call);
-    void handOver(std::uint64_t call, const TraceDescriptors& descriptors);
+    void handOver(std::uint64_t call, const EmitterDescriptors& descriptors);
     void breakOff(std::string reason);
     void end(std::optional<std::string> interruptedBecause);
 

@@ -1,6 +1,6 @@
 // The room of connections: the socket of the service, its clients' connections, and the frames that they exchange. It
-// touches sockets and epoll. It hands calls to a queue and a page of trace markers to clients that ask; it knows
-// neither what a call means nor what becomes of it.
+// touches sockets and epoll. It hands calls to a queue and the descriptors for trace events to clients that ask; it
+// knows neither what a call means nor what becomes of it.
 //
 // Accepts the connections of the socket under which the service is reached, and is the connection thread of all
 // of them: the thread that resumes the listener waits for all sockets at once and wakes for nothing else.
@@ -45,7 +45,7 @@ public:
 
     void setDelegate(ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
     // Who hands out the marker of the kernel's trace to clients that ask. Before `resume`.
-    void setTraceAccess(TraceMarkerAccess& access) { hub_->traceAccess = &access; }
+    void setEmitterAccess(EmitterAccess& access) { hub_->emitterAccess = &access; }
     // Called by `resume` when clients that connect from now on are served. Before `resume`.
     void setListeningHandler(std::move_only_function<void()> handler) { listeningHandler_ = std::move(handler); }
     void resume() override;

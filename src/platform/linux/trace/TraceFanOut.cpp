@@ -34,13 +34,13 @@ std::uint64_t TraceFanOut::nextEnd() const noexcept
     return end;
 }
 
-void TraceFanOut::deliver(std::span<const TracedMarker> events, std::uint64_t doneUpTo, std::uint64_t lost)
+void TraceFanOut::deliver(std::span<const CollectedEvent> events, std::uint64_t doneUpTo, std::uint64_t lost)
 {
     for (const Subscription& subscription : subscriptions_) {
         subscription->lost += lost;
-        const auto begin = std::ranges::lower_bound(events, subscription->startTime, {}, &TracedMarker::timestamp);
+        const auto begin = std::ranges::lower_bound(events, subscription->startTime, {}, &CollectedEvent::timestamp);
         const auto end =
-            std::ranges::upper_bound(begin, events.end(), subscription->endTime, {}, &TracedMarker::timestamp);
+            std::ranges::upper_bound(begin, events.end(), subscription->endTime, {}, &CollectedEvent::timestamp);
         submit(subscription, {begin, end});
         if (subscription->hasEnded() && subscription->endTime <= doneUpTo)
             complete(subscription);
@@ -49,12 +49,12 @@ void TraceFanOut::deliver(std::span<const TracedMarker> events, std::uint64_t do
                   [&](const Subscription& each) { return each->hasEnded() && each->endTime <= doneUpTo; });
 }
 
-void TraceFanOut::submit(const Subscription& subscription, std::span<const TracedMarker> events)
+void TraceFanOut::submit(const Subscription& subscription, std::span<const CollectedEvent> events)
 {
     std::vector<KernelTraceEvent> wanted;
-    for (const TracedMarker& event : events)
+    for (const CollectedEvent& event : events)
         if (std::ranges::any_of(subscription->filters,
-                                [&](const auto& each) { return each.accepts(event.record.code); }))
+                                [&](const auto& each) { return each.accepts(event.emitted.code); }))
             wanted.push_back(eventFor(*subscription, event));
     if (wanted.empty())
         return;
@@ -73,12 +73,12 @@ void TraceFanOut::submit(const Subscription& subscription, std::span<const Trace
     });
 }
 
-KernelTraceEvent TraceFanOut::eventFor(const TraceSubscription& subscription, const TracedMarker& event) const
+KernelTraceEvent TraceFanOut::eventFor(const TraceSubscription& subscription, const CollectedEvent& event) const
 {
     return {.timestamp = event.timestamp,
-            .arguments = event.record.arguments,
+            .arguments = event.emitted.arguments,
             .threadID = event.threadID,
-            .eventCode = event.record.code,
+            .eventCode = event.emitted.code,
             .cpu = event.cpu,
             .wallTime = subscription.hasWallTimes ? wallTime(event.timestamp) : KernelTraceWallTime()};
 }

@@ -6,7 +6,7 @@
 
 #include "platform/KernelTrace.h"
 #include "platform/linux/log/ProviderLog.h"
-#include "platform/linux/trace/TracedMarker.h"
+#include "platform/linux/trace/CollectedEvent.h"
 
 #include <atomic>
 #include <cstddef>
@@ -68,15 +68,15 @@ public:
     void setWallClock(std::int64_t ahead) noexcept { wallClockAhead_ = ahead; }
     // Delivers events, which are in the order of time. No further events up to `doneUpTo` will come: sessions that
     // ended by then are completed and removed. `lost` events count for all sessions.
-    void deliver(std::span<const TracedMarker> events, std::uint64_t doneUpTo, std::uint64_t lost);
+    void deliver(std::span<const CollectedEvent> events, std::uint64_t doneUpTo, std::uint64_t lost);
     // Calls a session's completion on its queue. `deliver` does this for all added sessions.
     void complete(const std::shared_ptr<TraceSubscription>& subscription) const;
 
 private:
     using Subscription = std::shared_ptr<TraceSubscription>;
 
-    void submit(const Subscription& subscription, std::span<const TracedMarker> events);
-    [[nodiscard]] KernelTraceEvent eventFor(const TraceSubscription& subscription, const TracedMarker& event) const;
+    void submit(const Subscription& subscription, std::span<const CollectedEvent> events);
+    [[nodiscard]] KernelTraceEvent eventFor(const TraceSubscription& subscription, const CollectedEvent& event) const;
     [[nodiscard]] KernelTraceWallTime wallTime(std::uint64_t timestamp) const;
 
     const ProviderLog log_;

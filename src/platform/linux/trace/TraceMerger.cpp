@@ -10,35 +10,35 @@ namespace {
 
 // A record: the kernel's type (2 bytes) and thread (4), then the bytes that were written to the marker.
 constexpr std::size_t threadOffset = 4;
-constexpr std::size_t markerOffset = 8;
-constexpr std::size_t recordSize = markerOffset + sizeof(TraceMarkerRecord);
+constexpr std::size_t eventOffset = 8;
+constexpr std::size_t recordSize = eventOffset + sizeof(EmittedEvent);
 
-bool isBefore(const TracedMarker& left, const TracedMarker& right)
+bool isBefore(const CollectedEvent& left, const CollectedEvent& right)
 {
     return left.timestamp < right.timestamp;
 }
 
 } // namespace
 
-bool TraceMerger::isMarker(std::span<const std::byte> record) const noexcept
+bool TraceMerger::isOwnEvent(std::span<const std::byte> record) const noexcept
 {
     return record.size() == recordSize && fieldAt<std::uint16_t>(record, 0) == recordType_
-        && fieldAt<std::uint32_t>(record, markerOffset) == TraceMarkerRecord::ownTag;
+        && fieldAt<std::uint32_t>(record, eventOffset) == EmittedEvent::ownTag;
 }
 
 void TraceMerger::take(std::uint32_t cpu, std::span<const std::byte> page)
 {
     if (cpu >= streams_.size())
         streams_.resize(cpu + 1);
-    TracePageReader reader(page, format_);
+    RingBufferPageReader reader(page, format_);
     losses_ += reader.missedEvents();
     while (const auto record = reader.next())
-        if (isMarker(record->bytes))
+        if (isOwnEvent(record->bytes))
             add(streams_[cpu], cpu, *record);
     losses_ += reader.isBroken() ? 1 : 0;
 }
 
-void TraceMerger::add(std::vector<TracedMarker>& stream, std::uint32_t cpu, const TraceRecord& record)
+void TraceMerger::add(std::vector<CollectedEvent>& stream, std::uint32_t cpu, const RingBufferRecord& record)
 {
     const bool isLate =
         record.timestamp <= doneUpTo_ || (!stream.empty() && record.timestamp < stream.back().timestamp);
@@ -47,20 +47,20 @@ void TraceMerger::add(std::vector<TracedMarker>& stream, std::uint32_t cpu, cons
         return;
     }
     ++waiting_;
-    TracedMarker& event = stream.emplace_back();
+    CollectedEvent& event = stream.emplace_back();
     event.timestamp = record.timestamp;
     event.threadID = fieldAt<std::uint32_t>(record.bytes, threadOffset);
     event.cpu = cpu;
-    event.record = fieldAt<TraceMarkerRecord>(record.bytes, markerOffset);
+    event.emitted = fieldAt<EmittedEvent>(record.bytes, eventOffset);
 }
 
-std::span<const TracedMarker> TraceMerger::eventsUpTo(std::uint64_t time)
+std::span<const CollectedEvent> TraceMerger::eventsUpTo(std::uint64_t time)
 {
     doneUpTo_ = std::max(doneUpTo_, time);
     merged_.clear();
     runs_.assign(1, 0);
     for (auto& stream : streams_) {
-        const auto end = std::ranges::upper_bound(stream, doneUpTo_, {}, &TracedMarker::timestamp);
+        const auto end = std::ranges::upper_bound(stream, doneUpTo_, {}, &CollectedEvent::timestamp);
         if (end == stream.begin())
             continue;
         merged_.insert(merged_.end(), stream.begin(), end);

@@ -5,8 +5,8 @@
 // event that comes too late is lost, because it would be in the wrong order.
 #pragma once
 
-#include "platform/linux/trace/TracePage.h"
-#include "platform/linux/trace/TracedMarker.h"
+#include "platform/linux/trace/CollectedEvent.h"
+#include "platform/linux/trace/RingBufferPage.h"
 
 #include <cstddef>
 #include <cstdint>
@@ -22,31 +22,33 @@ public:
     static constexpr std::size_t mostWaiting = 1'000'000;
 
     // `recordType` is the kernel's number for the records that the marker makes.
-    TraceMerger(TracePageFormat format, std::uint16_t recordType) noexcept
+    TraceMerger(RingBufferPageFormat format, std::uint16_t recordType) noexcept
         : format_(format),
-          recordType_(recordType) { }
+          recordType_(recordType)
+    {
+    }
 
     // Takes the service's own events out of a page, which may hold any bytes.
     void take(std::uint32_t cpu, std::span<const std::byte> page);
 
     // The events up to and including that time that were not returned before: in the order of time, events of the same
     // time in the order of the processors. Valid until the next call.
-    [[nodiscard]] std::span<const TracedMarker> eventsUpTo(std::uint64_t time);
+    [[nodiscard]] std::span<const CollectedEvent> eventsUpTo(std::uint64_t time);
 
     // How many events were lost since the last call: in the kernel, in broken pages (one each), because too many
     // waited, and because they came too late.
     [[nodiscard]] std::uint64_t takeLosses() noexcept;
 
 private:
-    [[nodiscard]] bool isMarker(std::span<const std::byte> record) const noexcept;
+    [[nodiscard]] bool isOwnEvent(std::span<const std::byte> record) const noexcept;
     void mergeNeighbours();
-    void add(std::vector<TracedMarker>& stream, std::uint32_t cpu, const TraceRecord& record);
+    void add(std::vector<CollectedEvent>& stream, std::uint32_t cpu, const RingBufferRecord& record);
 
-    const TracePageFormat format_;
+    const RingBufferPageFormat format_;
     const std::uint16_t recordType_;
-    std::vector<std::vector<TracedMarker>> streams_; // one a processor, each in the order of time
-    std::vector<TracedMarker> merged_;
-    std::vector<TracedMarker> merging_; // the result of a merge
+    std::vector<std::vector<CollectedEvent>> streams_; // one a processor, each in the order of time
+    std::vector<CollectedEvent> merged_;
+    std::vector<CollectedEvent> merging_; // the result of a merge
     std::vector<std::size_t> runs_; // the begins of the ordered parts of `merged_`, and its end
     std::size_t waiting_ = 0;
     std::uint64_t doneUpTo_ = 0;

@@ -159,7 +159,7 @@ std::expected<void, TracefsFailure> TracefsInstance::readFormats(const fs::path&
     const auto dataOffset = numberBehind(page, "char data;\toffset:");
     const auto commitSize = numberBehind(page, "commit;\toffset:8;\tsize:");
     if (!dataOffset || (commitSize != 4U && commitSize != 8U)
-        || *dataOffset < TracePageFormat::commitOffset + *commitSize || *dataOffset >= page_.size())
+        || *dataOffset < RingBufferPageFormat::commitOffset + *commitSize || *dataOffset >= page_.size())
         return unexpectedFormat(path / "events/header_page");
     pageFormat_ = {.commitSize = *commitSize, .dataOffset = *dataOffset};
 

@@ -7,7 +7,7 @@
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
-#include "platform/linux/trace/TracePage.h"
+#include "platform/linux/trace/RingBufferPage.h"
 
 #include <expected>
 #include <filesystem>
@@ -42,9 +42,9 @@ public:
     [[nodiscard]] static std::expected<TracefsInstance, TracefsFailure> open(const std::filesystem::path& tracefs,
                                                                              const std::string& name);
 
-    // The descriptor to which events are written as TraceMarkerRecord.
+    // The descriptor to which events are written as EmittedEvent.
     [[nodiscard]] int marker() const noexcept { return marker_.get(); }
-    [[nodiscard]] const TracePageFormat& pageFormat() const noexcept { return pageFormat_; }
+    [[nodiscard]] const RingBufferPageFormat& pageFormat() const noexcept { return pageFormat_; }
     // The type of the records that the marker makes.
     [[nodiscard]] std::uint16_t markerType() const noexcept { return markerType_; }
 
@@ -70,7 +70,7 @@ private:
     FileDescriptor marker_;
     std::vector<Pages> pages_;
     std::vector<std::byte> page_; // room for one
-    TracePageFormat pageFormat_;
+    RingBufferPageFormat pageFormat_;
     std::uint16_t markerType_ = 0;
 };
 

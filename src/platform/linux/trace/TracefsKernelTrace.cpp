@@ -91,10 +91,10 @@ private:
     const std::shared_ptr<TraceSubscription> subscription_ = std::make_shared<TraceSubscription>();
 };
 
-TracefsKernelTrace::TracefsKernelTrace(TracefsPlace place, TracefsMarkers& markers, TraceMarkerAccess& access,
+TracefsKernelTrace::TracefsKernelTrace(TracefsPlace place, TracefsEmitter& emitter, EmitterAccess& access,
                                        ProviderLog log)
     : place_(std::move(place)),
-      markers_(markers),
+      emitter_(emitter),
       access_(access),
       log_(log),
       fanOut_(log)
@@ -203,7 +203,7 @@ void TracefsKernelTrace::switchOff()
 void TracefsKernelTrace::tellEmitters()
 {
     const bool isTracing = isOn_ && fanOut_.isWanted();
-    markers_.setMarker(isTracing ? instance_->marker() : -1);
+    emitter_.setMarker(isTracing ? instance_->marker() : -1);
     access_.setTracing(isTracing);
 }
 

@@ -15,11 +15,11 @@
 #include "foundation/Mutex.h"
 #include "platform/KernelTrace.h"
 #include "platform/linux/log/ProviderLog.h"
+#include "platform/linux/trace/EmitterAccess.h"
 #include "platform/linux/trace/TraceFanOut.h"
-#include "platform/linux/trace/TraceMarkerAccess.h"
 #include "platform/linux/trace/TraceMerger.h"
+#include "platform/linux/trace/TracefsEmitter.h"
 #include "platform/linux/trace/TracefsInstance.h"
-#include "platform/linux/trace/TracefsMarkers.h"
 
 #include <chrono>
 #include <filesystem>
@@ -46,8 +46,8 @@ public:
     // Each service on a machine has an instance: the second service has this name with "-2", and so on.
     static constexpr int mostInstances = 8;
 
-    // Notifies the markers and the access when a trace starts or ends.
-    TracefsKernelTrace(TracefsPlace place, TracefsMarkers& markers, TraceMarkerAccess& access, ProviderLog log);
+    // Notifies the emitter and the access when a trace starts or ends.
+    TracefsKernelTrace(TracefsPlace place, TracefsEmitter& emitter, EmitterAccess& access, ProviderLog log);
     ~TracefsKernelTrace() override;
     TracefsKernelTrace(const TracefsKernelTrace&) = delete;
     TracefsKernelTrace& operator=(const TracefsKernelTrace&) = delete;
@@ -75,8 +75,8 @@ private:
     void read() KESTO_REQUIRES(lock_);
 
     const TracefsPlace place_;
-    TracefsMarkers& markers_;
-    TraceMarkerAccess& access_;
+    TracefsEmitter& emitter_;
+    EmitterAccess& access_;
     const ProviderLog log_;
 
     foundation::Mutex lock_;

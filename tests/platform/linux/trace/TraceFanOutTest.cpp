@@ -54,11 +54,11 @@ struct Listener {
     std::vector<std::size_t> completedAfter; // so many events
 };
 
-std::vector<TracedMarker> eventsAt(std::initializer_list<std::uint64_t> times, std::uint32_t code = 1)
+std::vector<CollectedEvent> eventsAt(std::initializer_list<std::uint64_t> times, std::uint32_t code = 1)
 {
-    std::vector<TracedMarker> events;
+    std::vector<CollectedEvent> events;
     for (const std::uint64_t time : times)
-        events.push_back({.timestamp = time, .record = {.code = code}});
+        events.push_back({.timestamp = time, .emitted = {.code = code}});
     return events;
 }
 
@@ -88,8 +88,10 @@ TEST_F(TraceFanOutTest, TellsASessionAllThatIsKnownOfAnEvent)
 {
     Listener listener(1);
     add(listener);
-    const TracedMarker event{
-        .timestamp = 7, .threadID = 4711, .cpu = 3, .record = {.code = 0x21040010, .arguments = {1, 2, 3, UINT64_MAX}}};
+    const CollectedEvent event{.timestamp = 7,
+                               .threadID = 4711,
+                               .cpu = 3,
+                               .emitted = {.code = 0x21040010, .arguments = {1, 2, 3, UINT64_MAX}}};
     fanOut.deliver({&event, 1}, 10, 0);
     listener.queue->run();
     EXPECT_EQ(listener.last.timestamp, 7U);
@@ -150,7 +152,7 @@ TEST_F(TraceFanOutTest, GivesEachSessionTheCodesThatItWants)
         add(*each);
     auto events = eventsAt({1}, 0);
     for (const std::uint32_t code : {9U, 10U, 19U, 20U})
-        events.push_back({.timestamp = code, .record = {.code = code}});
+        events.push_back({.timestamp = code, .emitted = {.code = code}});
     fanOut.deliver(events, 100, 0);
     for (const Listener* each : {&low, &high, &both})
         each->queue->run();
@@ -166,8 +168,8 @@ TEST_F(TraceFanOutTest, CallsEveryFilterThatAnEventFits)
         {9, 12, [&](const KernelTraceEvent& event) { listener.times.push_back(1000 + event.timestamp); }});
     add(listener);
     auto events = eventsAt({1}, 5);
-    events.push_back({.timestamp = 2, .record = {.code = 9}});
-    events.push_back({.timestamp = 3, .record = {.code = 12}});
+    events.push_back({.timestamp = 2, .emitted = {.code = 9}});
+    events.push_back({.timestamp = 3, .emitted = {.code = 12}});
     fanOut.deliver(events, 100, 0);
     listener.queue->run();
     EXPECT_THAT(listener.times, ElementsAre(1, 2, 1002, 1003));
@@ -240,7 +242,7 @@ TEST_F(TraceFanOutTest, LosesWhatAQueueIsTooFarBehindWith)
     Listener listener(1);
     Listener other(1);
     add(listener);
-    std::vector<TracedMarker> events(TraceFanOut::mostOnTheirWay - 1, {.timestamp = 1});
+    std::vector<CollectedEvent> events(TraceFanOut::mostOnTheirWay - 1, {.timestamp = 1});
     fanOut.deliver(events, 1, 0);
     add(other);
     fanOut.deliver(eventsAt({2, 3, 4}), 10, 0);
@@ -279,9 +281,9 @@ TEST_F(TraceFanOutTest, GivesAnySessionsWhatIsTheirs)
         cuts.push_back(1000);
         std::size_t done = 0;
         for (const std::uint64_t cut : cuts) {
-            std::vector<TracedMarker> events;
+            std::vector<CollectedEvent> events;
             for (; done < times.size() && times[done] <= cut; ++done)
-                events.push_back({.timestamp = times[done], .record = {.code = times[done] % 4U}});
+                events.push_back({.timestamp = times[done], .emitted = {.code = times[done] % 4U}});
             fanOut.deliver(events, cut, 0);
         }
         for (const Listener& listener : listeners) {

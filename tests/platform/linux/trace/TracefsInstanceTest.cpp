@@ -1,6 +1,6 @@
 // An instance on an imitation of tracefs: how it is found, set up, taken over and read, and the errors of each step.
 #include "platform/linux/trace/TracefsInstance.h"
-#include "platform/linux/trace/TracePages.h"
+#include "platform/linux/trace/ImitatedTracefs.h"
 
 #include <gmock/gmock.h>
 #include <sys/file.h>
@@ -10,8 +10,8 @@ namespace {
 
 namespace fs = std::filesystem;
 using support::readFile;
+using support::RingBufferPageBuilder;
 using support::TracefsTree;
-using support::TracePageBuilder;
 using support::writeFile;
 using testing::ElementsAre;
 using testing::EndsWith;
@@ -90,8 +90,8 @@ TEST_F(TracefsInstanceTest, HandsOutAllPagesOfAllProcessors)
     auto instance = open();
     ASSERT_TRUE(instance);
     EXPECT_THAT(pagesOf(*instance), IsEmpty());
-    const std::string one = TracePageBuilder(1).page();
-    const std::string two = TracePageBuilder(2).page();
+    const std::string one = RingBufferPageBuilder(1).page();
+    const std::string two = RingBufferPageBuilder(2).page();
     tree.put(1, one);
     tree.put(0, two);
     tree.put(1, two);
@@ -104,7 +104,7 @@ TEST_F(TracefsInstanceTest, TakesItsMarkersRecords)
     const auto instance = open();
     ASSERT_TRUE(instance);
     fs::resize_file(tree.instance / "trace_marker_raw", 0);
-    const TraceMarkerRecord record{.code = 7};
+    const EmittedEvent record{.code = 7};
     EXPECT_EQ(::write(instance->marker(), &record, sizeof record), 40);
     EXPECT_EQ(tree.content("trace_marker_raw").substr(0, 4), "KSTO");
 }

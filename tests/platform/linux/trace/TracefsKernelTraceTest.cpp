@@ -3,8 +3,8 @@
 #include "platform/linux/trace/TracefsKernelTrace.h"
 #include "platform/linux/queues/SerialQueue.h"
 #include "platform/linux/trace/DeliveredEvents.h"
+#include "platform/linux/trace/ImitatedTracefs.h"
 #include "platform/linux/trace/RealTracefs.h"
-#include "platform/linux/trace/TracePages.h"
 #include "support/Threads.h"
 #include "support/fakes/FakeLog.h"
 
@@ -24,7 +24,7 @@ namespace {
 
 namespace fs = std::filesystem;
 using support::IsLine;
-using support::TracePageBuilder;
+using support::RingBufferPageBuilder;
 using testing::Each;
 using testing::ElementsAre;
 using testing::HasSubstr;
@@ -109,15 +109,15 @@ protected:
 
     support::TracefsTree tree;
     support::FakeLog log;
-    TracefsMarkers ownMarkers;
-    TraceMarkerAccess access;
-    TracefsKernelTrace trace{{.mounts = tree.mounts, .instanceName = "kesto"}, ownMarkers, access, ProviderLog(log)};
+    TracefsEmitter ownEmitter;
+    EmitterAccess access;
+    TracefsKernelTrace trace{{.mounts = tree.mounts, .instanceName = "kesto"}, ownEmitter, access, ProviderLog(log)};
 };
 
 TEST_F(TracefsKernelTraceTest, TouchesNothingBeforeThereIsASession)
 {
     EXPECT_EQ(tree.content("tracing_on"), "before");
-    ownMarkers.emit(1, {});
+    ownEmitter.emit(1, {});
     EXPECT_EQ(markers(), "before");
 }
 
@@ -157,15 +157,15 @@ TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
     const std::int64_t day = timeOfDay();
     const std::uint64_t time = now();
     tree.put(0,
-             TracePageBuilder(1000)
+             RingBufferPageBuilder(1000)
                  .event(2000, firstCode) // before the start
                  .event(time, firstCode + 1, 77, {1, 2, 3, 4})
                  .event(time + 50, lastCode + 1)
                  .event(time + 100, lastCode)
                  .page());
-    tree.put(1, TracePageBuilder(time).event(time + 50, firstCode + 2).page());
+    tree.put(1, RingBufferPageBuilder(time).event(time + 50, firstCode + 2).page());
     ASSERT_TRUE(listener.waitForEvents(3));
-    tree.put(0, TracePageBuilder(time).event(now() + 3'000'000'000, firstCode + 3).page()); // after the end
+    tree.put(0, RingBufferPageBuilder(time).event(now() + 3'000'000'000, firstCode + 3).page()); // after the end
     listener.end();
     EXPECT_TRUE(listener.waitForCompletion());
     EXPECT_THAT(listener.codes(), ElementsAre(firstCode + 1, firstCode + 2, lastCode));
@@ -179,7 +179,7 @@ TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
 {
     Listener listener(trace);
     ASSERT_EQ(listener.start(), 0);
-    tree.put(0, TracePageBuilder(1000).event(now(), firstCode).missed(1840).page());
+    tree.put(0, RingBufferPageBuilder(1000).event(now(), firstCode).missed(1840).page());
     ASSERT_TRUE(listener.waitForEvents(1));
     listener.end();
     ASSERT_TRUE(listener.waitForCompletion());
@@ -194,8 +194,8 @@ TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
 
 TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherATraceRuns)
 {
-    std::optional<TraceDescriptors> handedOut;
-    access.ask(this, [&](const TraceDescriptors& descriptors) { handedOut = descriptors; });
+    std::optional<EmitterDescriptors> handedOut;
+    access.ask(this, [&](const EmitterDescriptors& descriptors) { handedOut = descriptors; });
     Listener one(trace);
     ASSERT_TRUE(handedOut) << "when the first session is made";
     const auto flag = [&] {
@@ -208,14 +208,14 @@ TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherATraceRuns)
     ASSERT_EQ(one.start(), 0);
     ASSERT_EQ(two.start(), 0);
     EXPECT_EQ(flag(), 1U);
-    ownMarkers.emit(0x2104482C, {});
+    ownEmitter.emit(0x2104482C, {});
     EXPECT_EQ(markers().substr(0, 8), std::string("KSTO\x2C\x48\x04\x21"));
     one.end();
     EXPECT_EQ(flag(), 1U);
     two.end();
     EXPECT_EQ(flag(), 0U) << "at once, although it is not complete";
     fs::resize_file(tree.instance / "trace_marker_raw", 0);
-    ownMarkers.emit(0x2104482C, {});
+    ownEmitter.emit(0x2104482C, {});
     EXPECT_EQ(markers(), "");
     EXPECT_TRUE(one.waitForCompletion());
     EXPECT_TRUE(two.waitForCompletion());
@@ -270,7 +270,7 @@ TEST_F(TracefsKernelTraceTest, TracesAlsoWhenClientsCannotEmitAndSaysSo)
     // No file may become as large as the page that clients map.
     rlimit before = {};
     ASSERT_EQ(::getrlimit(RLIMIT_FSIZE, &before), 0);
-    const rlimit small = {.rlim_cur = TraceMarkerPage::size - 1, .rlim_max = before.rlim_max};
+    const rlimit small = {.rlim_cur = TraceSwitchPage::size - 1, .rlim_max = before.rlim_max};
     const auto handler = std::signal(SIGXFSZ, SIG_IGN);
     ASSERT_EQ(::setrlimit(RLIMIT_FSIZE, &small), 0);
     const auto session = trace.createTraceSession();
@@ -344,17 +344,17 @@ protected:
     {
         if (tracefs.problem())
             GTEST_SKIP() << *tracefs.problem();
-        trace.emplace(TracefsPlace{.mounts = tracefs.mounts(), .instanceName = tracefs.instanceName}, ownMarkers,
+        trace.emplace(TracefsPlace{.mounts = tracefs.mounts(), .instanceName = tracefs.instanceName}, ownEmitter,
                       access, ProviderLog(log));
-        access.ask(this, [this](const TraceDescriptors& descriptors) { marker = descriptors.marker; });
+        access.ask(this, [this](const EmitterDescriptors& descriptors) { marker = descriptors.marker; });
     }
 
-    void write(const TraceMarkerRecord& record) const { EXPECT_EQ(::write(marker, &record, sizeof record), 40); }
+    void write(const EmittedEvent& record) const { EXPECT_EQ(::write(marker, &record, sizeof record), 40); }
 
     support::RealTracefs tracefs;
     support::FakeLog log;
-    TracefsMarkers ownMarkers;
-    TraceMarkerAccess access;
+    TracefsEmitter ownEmitter;
+    EmitterAccess access;
     std::optional<TracefsKernelTrace> trace;
     int marker = -1;
 };
@@ -362,16 +362,16 @@ protected:
 TEST_F(RealTraceTest, DeliversTheEventsOfThisProcessWithTheirTimes)
 {
     Listener listener(*trace);
-    const TraceMarkerRecord early{.code = firstCode};
+    const EmittedEvent early{.code = firstCode};
     EXPECT_LT(::write(marker, &early, sizeof early), 0) << "the kernel takes no events while no trace runs";
     ASSERT_EQ(listener.start(), 0);
     const std::int64_t day = timeOfDay();
     const std::uint64_t before = now();
-    ownMarkers.emit(firstCode + 1, {1, 2, 3, UINT64_MAX});
+    ownEmitter.emit(firstCode + 1, {1, 2, 3, UINT64_MAX});
     const std::uint64_t between = now();
-    ownMarkers.emit(firstCode + 2, {});
+    ownEmitter.emit(firstCode + 2, {});
     const std::uint64_t after = now();
-    ownMarkers.emit(lastCode + 1, {});
+    ownEmitter.emit(lastCode + 1, {});
     listener.end();
     ASSERT_TRUE(listener.waitForCompletion());
     ASSERT_THAT(listener.codes(), ElementsAre(firstCode + 1, firstCode + 2));
@@ -410,8 +410,7 @@ TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
             for (std::size_t number = 0; number < Emitter::most; ++number) {
                 while (number >= emitter.allowed)
                     ::sched_yield();
-                const TraceMarkerRecord record{.code = firstCode + static_cast<std::uint32_t>(index),
-                                               .arguments = {number}};
+                const EmittedEvent record{.code = firstCode + static_cast<std::uint32_t>(index), .arguments = {number}};
                 emitter.moments[number].before = now();
                 (void)!::write(marker, &record, sizeof record);
                 emitter.moments[number].after = now();
@@ -497,7 +496,7 @@ TEST_F(RealTraceTest, LeavesOutWhatOthersWriteToTheMarker)
     const std::string noise(3000, 'K');
     for (const std::size_t size : {4U, 39U, 41U, 40U, 3000U})
         EXPECT_EQ(::write(marker, noise.data(), size), static_cast<ssize_t>(size));
-    TraceMarkerRecord record{.code = firstCode};
+    EmittedEvent record{.code = firstCode};
     EXPECT_LT(::write(marker, &record, 3), 0) << "the kernel wants a tag";
     EXPECT_EQ(::write(marker, &record, 36), 36);
     write(record);
@@ -513,7 +512,7 @@ TEST_F(RealTraceTest, CountsWhatTheKernelLost)
     ASSERT_TRUE(instance) << instance.error().what;
     ASSERT_FALSE(instance->switchOn());
     constexpr std::size_t emitted = 500'000;
-    const TraceMarkerRecord record{.code = firstCode};
+    const EmittedEvent record{.code = firstCode};
     for (std::size_t count = 0; count < emitted; ++count)
         ASSERT_EQ(::write(instance->marker(), &record, sizeof record), 40);
     TraceMerger merger(instance->pageFormat(), instance->markerType());
@@ -535,7 +534,7 @@ TEST_F(RealTraceTest, TakesOverWhatAKilledServiceLeftBehind)
     if (child == 0) {
         auto instance = TracefsInstance::open(tracefs.path(), tracefs.instanceName);
         const bool isOn = instance && !instance->switchOn();
-        const TraceMarkerRecord record{.code = firstCode};
+        const EmittedEvent record{.code = firstCode};
         if (isOn)
             (void)!::write(instance->marker(), &record, sizeof record);
         (void)!::write(ready[1], isOn ? "1" : "0", 1);
@@ -556,7 +555,7 @@ TEST_F(RealTraceTest, TakesOverWhatAKilledServiceLeftBehind)
     ::waitpid(child, nullptr, 0);
     Listener listener(*trace);
     ASSERT_EQ(listener.start(), 0);
-    ownMarkers.emit(firstCode + 1, {});
+    ownEmitter.emit(firstCode + 1, {});
     listener.end();
     ASSERT_TRUE(listener.waitForCompletion());
     EXPECT_THAT(listener.codes(), ElementsAre(firstCode + 1));
@@ -565,16 +564,16 @@ TEST_F(RealTraceTest, TakesOverWhatAKilledServiceLeftBehind)
 
 TEST_F(RealTraceTest, HasAnInstanceForEachServiceOnTheMachine)
 {
-    TracefsMarkers otherMarkers;
-    TraceMarkerAccess otherAccess;
-    TracefsKernelTrace other({.mounts = tracefs.mounts(), .instanceName = tracefs.instanceName}, otherMarkers,
+    TracefsEmitter otherEmitter;
+    EmitterAccess otherAccess;
+    TracefsKernelTrace other({.mounts = tracefs.mounts(), .instanceName = tracefs.instanceName}, otherEmitter,
                              otherAccess, ProviderLog(log));
     Listener one(*trace);
     Listener two(other);
     ASSERT_EQ(one.start(), 0);
     ASSERT_EQ(two.start(), 0);
-    ownMarkers.emit(firstCode + 1, {});
-    otherMarkers.emit(firstCode + 2, {});
+    ownEmitter.emit(firstCode + 1, {});
+    otherEmitter.emit(firstCode + 2, {});
     one.end();
     two.end();
     ASSERT_TRUE(one.waitForCompletion());

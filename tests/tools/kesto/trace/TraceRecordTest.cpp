@@ -56,7 +56,7 @@ protected:
     // Of a program that emits.
     [[nodiscard]] Finished recordEmitter(const Tool::Arguments& further, Tool::Arguments words) const
     {
-        words.insert(words.begin(), KESTO_TRACE_EMITTER);
+        words.insert(words.begin(), KESTO_MEASURED_PROGRAM);
         return record(further, words);
     }
     void expectNothingIsRun(const Finished& finished, const std::string& reason) const

@@ -1,6 +1,6 @@
 // A program to be measured: emits so many pairs of events, prints its arguments, and ends with the given status.
 //
-//     trace_emitter COUNT STATUS [WORD...]
+//     kesto_measured_program COUNT STATUS [WORD...]
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>

@@ -1,4 +1,4 @@
-// Markers in the kernel's trace.
+// Events of this service in the kernel's trace.
 #pragma once
 
 #include <array>
@@ -7,9 +7,9 @@
 namespace platform {
 
 // Any thread.
-class TraceMarkers {
+class TraceEmitter {
 public:
-    virtual ~TraceMarkers() = default;
+    virtual ~TraceEmitter() = default;
     // Emits one kernel trace event; does nothing while no trace runs.
     virtual void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) = 0;
 };

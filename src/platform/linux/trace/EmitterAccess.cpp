@@ -1,9 +1,9 @@
 // The page is a sealed memory file: the service maps it for writing first, and the seal then forbids all later writable
 // mappings. Answers are given without the lock.
-#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/EmitterAccess.h"
 
 #include "platform/linux/files/SystemError.h"
-#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/EmitterInterface.h"
 
 #include <atomic>
 #include <cassert>
@@ -17,16 +17,16 @@ namespace {
 
 } // namespace
 
-TraceMarkerAccess::~TraceMarkerAccess()
+EmitterAccess::~EmitterAccess()
 {
     const foundation::Lock lock(lock_);
     if (mapping_ != nullptr)
-        ::munmap(mapping_, TraceMarkerPage::size);
+        ::munmap(mapping_, TraceSwitchPage::size);
 }
 
-void TraceMarkerAccess::ask(const void* asker, Answer answer)
+void EmitterAccess::ask(const void* asker, Answer answer)
 {
-    TraceDescriptors descriptors;
+    EmitterDescriptors descriptors;
     {
         const foundation::Lock lock(lock_);
         if (!descriptors_) {
@@ -38,25 +38,25 @@ void TraceMarkerAccess::ask(const void* asker, Answer answer)
     answer(descriptors);
 }
 
-void TraceMarkerAccess::forget(const void* asker)
+void EmitterAccess::forget(const void* asker)
 {
     const foundation::Lock lock(lock_);
     waiting_.erase(asker);
 }
 
 // The service makes its own mapping before the seal, which forbids later writable mappings.
-std::error_code TraceMarkerAccess::open(int marker)
+std::error_code EmitterAccess::open(int marker)
 {
     constexpr int seals = F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_FUTURE_WRITE | F_SEAL_SEAL;
     std::map<const void*, Answer> waiting;
-    TraceDescriptors descriptors;
+    EmitterDescriptors descriptors;
     {
         const foundation::Lock lock(lock_);
         assert(!descriptors_);
         FileDescriptor page(::memfd_create("kesto-trace", MFD_CLOEXEC | MFD_ALLOW_SEALING));
-        if (!page || ::ftruncate(page.get(), TraceMarkerPage::size) != 0)
+        if (!page || ::ftruncate(page.get(), TraceSwitchPage::size) != 0)
             return systemError();
-        void* const mapping = ::mmap(nullptr, TraceMarkerPage::size, PROT_READ | PROT_WRITE, MAP_SHARED, page.get(), 0);
+        void* const mapping = ::mmap(nullptr, TraceSwitchPage::size, PROT_READ | PROT_WRITE, MAP_SHARED, page.get(), 0);
         if (mapping == MAP_FAILED)
             return systemError();
         mapping_ = mapping;
@@ -72,11 +72,11 @@ std::error_code TraceMarkerAccess::open(int marker)
     return {};
 }
 
-void TraceMarkerAccess::setTracing(bool isTracing) noexcept
+void EmitterAccess::setTracing(bool isTracing) noexcept
 {
     const foundation::Lock lock(lock_);
     if (descriptors_)
-        std::atomic_ref(static_cast<TraceMarkerPage*>(mapping_)->isTracing)
+        std::atomic_ref(static_cast<TraceSwitchPage*>(mapping_)->isTracing)
             .store(isTracing ? 1 : 0, std::memory_order_release);
 }
 

@@ -14,7 +14,7 @@
 namespace platform {
 
 // The layout of a page, which depends on the size of the kernel's `long` (events/header_page).
-struct TracePageFormat {
+struct RingBufferPageFormat {
     static constexpr std::size_t commitOffset = 8;
 
     std::size_t commitSize = 8; // of a `long`
@@ -29,18 +29,18 @@ template <typename Field> Field fieldAt(std::span<const std::byte> bytes, std::s
     return field;
 }
 
-struct TraceRecord {
+struct RingBufferRecord {
     std::uint64_t timestamp = 0; // of the trace's clock
     std::span<const std::byte> bytes; // from the record's type on; valid as long as the page
 };
 
 // Reads one page, which must stay valid meanwhile. One thread.
-class TracePageReader {
+class RingBufferPageReader {
 public:
-    TracePageReader(std::span<const std::byte> page, const TracePageFormat& format);
+    RingBufferPageReader(std::span<const std::byte> page, const RingBufferPageFormat& format);
 
     // The next record, or nothing at the page's end or where the page is broken.
-    [[nodiscard]] std::optional<TraceRecord> next();
+    [[nodiscard]] std::optional<RingBufferRecord> next();
 
     // The number of events that were lost before this page because the buffer was full; 1 if the kernel does not report
     // the number.
@@ -64,8 +64,8 @@ private:
         isBroken_ |= rest_.size() < words * wordSize;
         return !isBroken_;
     }
-    [[nodiscard]] std::optional<TraceRecord> takeRecord(std::size_t headSize, std::size_t size) noexcept;
-    [[nodiscard]] std::optional<TraceRecord> takeLongRecord() noexcept;
+    [[nodiscard]] std::optional<RingBufferRecord> takeRecord(std::size_t headSize, std::size_t size) noexcept;
+    [[nodiscard]] std::optional<RingBufferRecord> takeLongRecord() noexcept;
     void skipPadding(std::uint32_t delta) noexcept;
     void setTime(std::uint32_t low) noexcept;
 
@@ -76,7 +76,7 @@ private:
 };
 
 // Inline, because nearly all the time is spent here.
-inline std::optional<TraceRecord> TracePageReader::next()
+inline std::optional<RingBufferRecord> RingBufferPageReader::next()
 {
     while (!rest_.empty() && holds(1)) {
         const std::uint32_t kind = word(0) & ((1U << kindBits) - 1);
@@ -97,13 +97,13 @@ inline std::optional<TraceRecord> TracePageReader::next()
     return std::nullopt;
 }
 
-inline std::optional<TraceRecord> TracePageReader::takeRecord(std::size_t headSize, std::size_t size) noexcept
+inline std::optional<RingBufferRecord> RingBufferPageReader::takeRecord(std::size_t headSize, std::size_t size) noexcept
 {
     if (size > rest_.size() - headSize) {
         isBroken_ = true;
         return std::nullopt;
     }
-    const TraceRecord record{time_, rest_.subspan(headSize, size)};
+    const RingBufferRecord record{time_, rest_.subspan(headSize, size)};
     const std::size_t whole = headSize + (size + wordSize - 1) / wordSize * wordSize;
     rest_ = whole < rest_.size() ? rest_.subspan(whole) : std::span<const std::byte>();
     return record;

@@ -1,8 +1,8 @@
-// Keeps trace markers in the order in which they were emitted.
+// Keeps trace events in the order in which they were emitted.
 #pragma once
 
 #include "foundation/Mutex.h"
-#include "platform/TraceMarkers.h"
+#include "platform/TraceEmitter.h"
 
 #include <functional>
 #include <gtest/gtest.h>
@@ -11,14 +11,14 @@
 
 namespace support {
 
-struct TraceMarkerEvent {
+struct KeptEmission {
     std::uint32_t code = 0;
     std::array<std::uint64_t, 4> arguments{};
-    friend bool operator==(const TraceMarkerEvent&, const TraceMarkerEvent&) = default;
+    friend bool operator==(const KeptEmission&, const KeptEmission&) = default;
 };
 
 // Any thread.
-class FakeTraceMarkers final : public platform::TraceMarkers {
+class FakeTraceEmitter final : public platform::TraceEmitter {
 public:
     // The observer gets each code at once.
     void setObserver(std::function<void(std::uint32_t)> observer) { observer_ = std::move(observer); }
@@ -29,18 +29,19 @@ public:
         isTraced_ = isTraced;
     }
 
-    // The codes since the last time, of the service's markers.
+    // The codes since the last time, of the service's own events.
     std::vector<std::uint32_t> take()
     {
         std::vector<std::uint32_t> codes;
-        for (const TraceMarkerEvent& event : takeEvents()) {
-            EXPECT_EQ(event.arguments, (std::array<std::uint64_t, 4>{})) << "the service's markers carry no arguments";
+        for (const KeptEmission& event : takeEvents()) {
+            EXPECT_EQ(event.arguments, (std::array<std::uint64_t, 4>{}))
+                << "the service's own events carry no arguments";
             codes.push_back(event.code);
         }
         return codes;
     }
     // The same, for all emitters.
-    std::vector<TraceMarkerEvent> takeEvents()
+    std::vector<KeptEmission> takeEvents()
     {
         const foundation::Lock lock(lock_);
         return std::exchange(events_, {});
@@ -59,7 +60,7 @@ private:
     std::function<void(std::uint32_t)> observer_;
     foundation::Mutex lock_;
     bool isTraced_ KESTO_GUARDED_BY(lock_) = true;
-    std::vector<TraceMarkerEvent> events_ KESTO_GUARDED_BY(lock_);
+    std::vector<KeptEmission> events_ KESTO_GUARDED_BY(lock_);
 };
 
 } // namespace support

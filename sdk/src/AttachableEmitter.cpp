@@ -1,7 +1,7 @@
 // All steps that can fail come before the exchange, which is one system call.
-#include "Tracer.h"
+#include "AttachableEmitter.h"
 
-#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/EmitterInterface.h"
 
 #include <cerrno>
 #include <fcntl.h>
@@ -29,9 +29,9 @@ static void AnnotateIgnoreWritesEnd(const char*, int) { }
 namespace libkesto {
 namespace {
 
+using platform::EmittedEvent;
 using platform::FileDescriptor;
-using platform::TraceMarkerPage;
-using platform::TraceMarkerRecord;
+using platform::TraceSwitchPage;
 
 // Whether the file has the right size and is sealed against shrinking: reading a page beyond a file's end kills the
 // program.
@@ -39,7 +39,7 @@ bool isPage(const FileDescriptor& file) noexcept
 {
     struct stat status = {};
     const int seals = ::fcntl(file.get(), F_GET_SEALS);
-    return ::fstat(file.get(), &status) == 0 && status.st_size >= static_cast<off_t>(TraceMarkerPage::size)
+    return ::fstat(file.get(), &status) == 0 && status.st_size >= static_cast<off_t>(TraceSwitchPage::size)
         && seals >= 0 && (seals & F_SEAL_SHRINK) != 0;
 }
 
@@ -49,43 +49,43 @@ constexpr int emptyPage = MAP_PRIVATE | MAP_ANONYMOUS;
 void* mapPage(void* place, int flags, int file) noexcept
 {
     AnnotateIgnoreWritesBegin(__FILE__, __LINE__);
-    void* const page = ::mmap(place, TraceMarkerPage::size, PROT_READ, flags, file, 0);
+    void* const page = ::mmap(place, TraceSwitchPage::size, PROT_READ, flags, file, 0);
     AnnotateIgnoreWritesEnd(__FILE__, __LINE__);
     return page;
 }
 
 } // namespace
 
-std::unique_ptr<Tracer> Tracer::create()
+std::unique_ptr<AttachableEmitter> AttachableEmitter::create()
 {
-    std::unique_ptr<Tracer> tracer(new Tracer);
-    tracer->nowhere_ = FileDescriptor(::open("/", O_PATH | O_CLOEXEC));
+    std::unique_ptr<AttachableEmitter> emitter(new AttachableEmitter);
+    emitter->nowhere_ = FileDescriptor(::open("/", O_PATH | O_CLOEXEC));
     void* const page = mapPage(nullptr, emptyPage, -1);
     if (page == MAP_FAILED)
         return nullptr;
-    tracer->page_ = page;
-    tracer->is_tracing = &static_cast<const TraceMarkerPage*>(page)->isTracing;
-    if (tracer->nowhere_)
-        tracer->marker_ = FileDescriptor(::fcntl(tracer->nowhere_.get(), F_DUPFD_CLOEXEC, 0));
-    return tracer->marker_ ? std::move(tracer) : nullptr;
+    emitter->page_ = page;
+    emitter->is_tracing = &static_cast<const TraceSwitchPage*>(page)->isTracing;
+    if (emitter->nowhere_)
+        emitter->marker_ = FileDescriptor(::fcntl(emitter->nowhere_.get(), F_DUPFD_CLOEXEC, 0));
+    return emitter->marker_ ? std::move(emitter) : nullptr;
 }
 
-Tracer::~Tracer()
+AttachableEmitter::~AttachableEmitter()
 {
     if (page_ != nullptr)
-        ::munmap(page_, TraceMarkerPage::size);
+        ::munmap(page_, TraceSwitchPage::size);
 }
 
-void Tracer::emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) const noexcept
+void AttachableEmitter::emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) const noexcept
 {
     const int before = errno;
-    const TraceMarkerRecord record{.code = code, .arguments = arguments};
+    const EmittedEvent record{.code = code, .arguments = arguments};
     [[maybe_unused]] const ssize_t written = ::write(marker_.get(), &record, sizeof record);
     errno = before;
 }
 
 // Exchanges the marker first: callers emit only after the page shows a trace.
-bool Tracer::attach(TraceDescriptors descriptors) noexcept
+bool AttachableEmitter::attach(ReceivedDescriptors descriptors) noexcept
 {
     const auto& [marker, page] = descriptors;
     return marker && isPage(page) && ::dup3(marker.get(), marker_.get(), O_CLOEXEC) >= 0
@@ -94,7 +94,7 @@ bool Tracer::attach(TraceDescriptors descriptors) noexcept
 
 // Exchanges the marker first, too, so that late events are discarded. Neither exchange can fail, because it needs
 // neither a new descriptor nor a new range of addresses.
-void Tracer::detach() noexcept
+void AttachableEmitter::detach() noexcept
 {
     static_cast<void>(::dup3(nowhere_.get(), marker_.get(), O_CLOEXEC));
     static_cast<void>(mapPage(page_, emptyPage | MAP_FIXED, -1));

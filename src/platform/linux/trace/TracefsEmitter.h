@@ -1,14 +1,14 @@
-// The service's own events in the kernel's trace.
+// Writes the service's own events into the kernel's trace.
 #pragma once
 
-#include "platform/TraceMarkers.h"
+#include "platform/TraceEmitter.h"
 
 #include <atomic>
 
 namespace platform {
 
 // Any thread.
-class TracefsMarkers final : public TraceMarkers {
+class TracefsEmitter final : public TraceEmitter {
 public:
     // Costs a load and a branch while no trace runs. Failed writes are ignored.
     void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments) override;

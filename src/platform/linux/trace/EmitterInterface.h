@@ -9,17 +9,17 @@
 namespace platform {
 
 // One event, as it is written to the marker in one piece. The kernel adds time, thread and processor.
-struct TraceMarkerRecord {
+struct EmittedEvent {
     static constexpr std::uint32_t ownTag = 0x4F54534B; // the bytes "KSTO"; records without it are foreign
 
     std::uint32_t tag = ownTag;
     std::uint32_t code = 0;
     std::array<std::uint64_t, 4> arguments{};
 };
-static_assert(sizeof(TraceMarkerRecord) == 40);
+static_assert(sizeof(EmittedEvent) == 40);
 
 // The shared page. Only the service writes to it; a reader may see a change a moment later.
-struct TraceMarkerPage {
+struct TraceSwitchPage {
     static constexpr std::size_t size = 4096; // of the file; all but the first field is 0 and reserved
 
     std::uint32_t isTracing = 0; // 0: no trace runs

@@ -3,16 +3,16 @@
 // when it gets the event.
 #pragma once
 
-#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/EmitterInterface.h"
 
 namespace platform {
 
-struct TracedMarker {
+struct CollectedEvent {
     std::uint64_t timestamp = 0; // of the trace's clock
     std::uint32_t threadID = 0;
     std::uint32_t cpu = 0;
-    TraceMarkerRecord record{}; // as it was written to the marker
+    EmittedEvent emitted{}; // as it was written to the marker
 };
-static_assert(sizeof(TracedMarker) == 56);
+static_assert(sizeof(CollectedEvent) == 56);
 
 } // namespace platform

@@ -21,9 +21,9 @@ void require(bool holds)
         std::abort();
 }
 
-std::size_t requireRecordsInside(const Page& page, const platform::TracePageFormat& format)
+std::size_t requireRecordsInside(const Page& page, const platform::RingBufferPageFormat& format)
 {
-    platform::TracePageReader reader(page, format);
+    platform::RingBufferPageReader reader(page, format);
     const std::byte* last = page.data();
     std::size_t count = 0;
     while (const auto record = reader.next()) {
@@ -48,7 +48,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     std::uint64_t last = 0;
     std::size_t events = 0;
     const auto takeUpTo = [&](std::uint64_t time) {
-        for (const platform::TracedMarker& event : merger.eventsUpTo(time)) {
+        for (const platform::CollectedEvent& event : merger.eventsUpTo(time)) {
             require(event.timestamp >= last && event.timestamp <= time);
             last = event.timestamp;
             ++events;

@@ -1,6 +1,6 @@
 // Every length is checked against the rest of the page; the first that does not fit ends the page, because the records
 // behind it cannot be found any more.
-#include "platform/linux/trace/TracePage.h"
+#include "platform/linux/trace/RingBufferPage.h"
 
 namespace platform {
 namespace {
@@ -19,14 +19,14 @@ std::uint64_t numberAt(std::span<const std::byte> bytes, std::size_t offset, std
 
 } // namespace
 
-TracePageReader::TracePageReader(std::span<const std::byte> page, const TracePageFormat& format)
+RingBufferPageReader::RingBufferPageReader(std::span<const std::byte> page, const RingBufferPageFormat& format)
 {
     if (page.size() < format.dataOffset) {
         isBroken_ = true;
         return;
     }
     time_ = fieldAt<std::uint64_t>(page, 0);
-    const std::uint64_t commit = numberAt(page, TracePageFormat::commitOffset, format.commitSize);
+    const std::uint64_t commit = numberAt(page, RingBufferPageFormat::commitOffset, format.commitSize);
     const std::span<const std::byte> data = page.subspan(format.dataOffset);
     const std::size_t size = commit & committedBytes;
     if (size > data.size()) {
@@ -41,7 +41,7 @@ TracePageReader::TracePageReader(std::span<const std::byte> page, const TracePag
 }
 
 // A record of more than 28 words has its length in a word of its own; the length includes that word.
-std::optional<TraceRecord> TracePageReader::takeLongRecord() noexcept
+std::optional<RingBufferRecord> RingBufferPageReader::takeLongRecord() noexcept
 {
     if (!holds(2))
         return std::nullopt;
@@ -54,7 +54,7 @@ std::optional<TraceRecord> TracePageReader::takeLongRecord() noexcept
 }
 
 // Without a time, only padding follows; with a time, it replaces an event that was taken back.
-void TracePageReader::skipPadding(std::uint32_t delta) noexcept
+void RingBufferPageReader::skipPadding(std::uint32_t delta) noexcept
 {
     if (delta == 0) {
         rest_ = {};
@@ -70,7 +70,7 @@ void TracePageReader::skipPadding(std::uint32_t delta) noexcept
 }
 
 // The lower 59 bits of the time: the upper ones stay.
-void TracePageReader::setTime(std::uint32_t low) noexcept
+void RingBufferPageReader::setTime(std::uint32_t low) noexcept
 {
     constexpr std::uint64_t given = (std::uint64_t{1} << (deltaBits + 32)) - 1;
     if (!holds(2))

@@ -1,7 +1,7 @@
 // The descriptors with which clients emit trace events: when clients get them, which clients do, and their limits.
-#include "platform/linux/trace/TraceMarkerAccess.h"
+#include "platform/linux/trace/EmitterAccess.h"
 #include "platform/linux/connection/ConnectionHarness.h"
-#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/EmitterInterface.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>
@@ -37,51 +37,51 @@ public:
 
 std::uint32_t flagIn(int page)
 {
-    void* const mapping = ::mmap(nullptr, TraceMarkerPage::size, PROT_READ, MAP_SHARED, page, 0);
+    void* const mapping = ::mmap(nullptr, TraceSwitchPage::size, PROT_READ, MAP_SHARED, page, 0);
     EXPECT_NE(mapping, MAP_FAILED);
-    const std::uint32_t flag = static_cast<const TraceMarkerPage*>(mapping)->isTracing;
-    ::munmap(mapping, TraceMarkerPage::size);
+    const std::uint32_t flag = static_cast<const TraceSwitchPage*>(mapping)->isTracing;
+    ::munmap(mapping, TraceSwitchPage::size);
     return flag;
 }
 
-class TraceMarkerAccessTest : public testing::Test {
+class EmitterAccessTest : public testing::Test {
 protected:
-    TraceDescriptors opened()
+    EmitterDescriptors opened()
     {
         EXPECT_FALSE(access.open(marker.in.get()));
-        TraceDescriptors result;
-        access.ask(this, [&](const TraceDescriptors& descriptors) { result = descriptors; });
+        EmitterDescriptors result;
+        access.ask(this, [&](const EmitterDescriptors& descriptors) { result = descriptors; });
         return result;
     }
 
     Pipe marker;
-    TraceMarkerAccess access;
+    EmitterAccess access;
 };
 
-TEST_F(TraceMarkerAccessTest, AnswersOnceThereIsSomethingToHandOut)
+TEST_F(EmitterAccessTest, AnswersOnceThereIsSomethingToHandOut)
 {
     std::vector<int> answers;
-    access.ask(&answers, [&](const TraceDescriptors& descriptors) { answers.push_back(descriptors.marker); });
+    access.ask(&answers, [&](const EmitterDescriptors& descriptors) { answers.push_back(descriptors.marker); });
     access.setTracing(true);
     EXPECT_THAT(answers, IsEmpty());
     ASSERT_FALSE(access.open(marker.in.get()));
     EXPECT_THAT(answers, ElementsAre(marker.in.get()));
-    access.ask(&answers, [&](const TraceDescriptors& descriptors) { answers.push_back(descriptors.marker); });
+    access.ask(&answers, [&](const EmitterDescriptors& descriptors) { answers.push_back(descriptors.marker); });
     EXPECT_EQ(answers.size(), 2U);
 }
 
-TEST_F(TraceMarkerAccessTest, ForgetsWhoDoesNotWaitAnyMore)
+TEST_F(EmitterAccessTest, ForgetsWhoDoesNotWaitAnyMore)
 {
     bool isAnswered = false;
-    access.ask(this, [&](const TraceDescriptors&) { isAnswered = true; });
+    access.ask(this, [&](const EmitterDescriptors&) { isAnswered = true; });
     access.forget(this);
     ASSERT_FALSE(access.open(marker.in.get()));
     EXPECT_FALSE(isAnswered);
 }
 
-TEST_F(TraceMarkerAccessTest, ShowsOnThePageWhetherATraceRuns)
+TEST_F(EmitterAccessTest, ShowsOnThePageWhetherATraceRuns)
 {
-    const TraceDescriptors descriptors = opened();
+    const EmitterDescriptors descriptors = opened();
     EXPECT_EQ(flagIn(descriptors.page), 0U);
     access.setTracing(true);
     EXPECT_EQ(flagIn(descriptors.page), 1U);
@@ -89,7 +89,7 @@ TEST_F(TraceMarkerAccessTest, ShowsOnThePageWhetherATraceRuns)
     EXPECT_EQ(flagIn(descriptors.page), 0U);
 }
 
-TEST_F(TraceMarkerAccessTest, DoesNotLetOthersChangeThePage)
+TEST_F(EmitterAccessTest, DoesNotLetOthersChangeThePage)
 {
     const int page = opened().page;
     EXPECT_EQ(::mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED, page, 0), MAP_FAILED);
@@ -112,7 +112,7 @@ TEST_F(TraceMarkerAccessTest, DoesNotLetOthersChangeThePage)
 
 // ---- Over connections
 
-class TraceMarkerConnections : public support::ConnectionTest {
+class EmitterAccessConnections : public support::ConnectionTest {
 protected:
     // The numbers of the answers up to that of the request, and the descriptors that came with them.
     struct Received {
@@ -163,14 +163,14 @@ protected:
 
     void SetUp() override
     {
-        beforeListening = [this] { listener->setTraceAccess(access); };
+        beforeListening = [this] { listener->setEmitterAccess(access); };
     }
 
     Pipe marker;
-    TraceMarkerAccess access;
+    EmitterAccess access;
 };
 
-TEST_F(TraceMarkerConnections, HandOverTheMarkerAndThePage)
+TEST_F(EmitterAccessConnections, HandOverTheMarkerAndThePage)
 {
     ASSERT_FALSE(access.open(marker.in.get()));
     access.setTracing(true);
@@ -187,7 +187,7 @@ TEST_F(TraceMarkerConnections, HandOverTheMarkerAndThePage)
     EXPECT_EQ(flagIn(received.descriptors[1].get()), 1U);
 }
 
-TEST_F(TraceMarkerConnections, AreAnsweredWhenTheFirstTraceStarts)
+TEST_F(EmitterAccessConnections, AreAnsweredWhenTheFirstTraceStarts)
 {
     listen();
     Client client(path);
@@ -201,7 +201,7 @@ TEST_F(TraceMarkerConnections, AreAnsweredWhenTheFirstTraceStarts)
     EXPECT_EQ(received.descriptors.size(), 2U);
 }
 
-TEST_F(TraceMarkerConnections, MayAskOnce)
+TEST_F(EmitterAccessConnections, MayAskOnce)
 {
     listen();
     Client client(path);
@@ -210,7 +210,7 @@ TEST_F(TraceMarkerConnections, MayAskOnce)
     EXPECT_THAT(logged(), ElementsAre(endsBecause("it asks for the trace marker twice")));
 }
 
-TEST_F(TraceMarkerConnections, AskWithANumber)
+TEST_F(EmitterAccessConnections, AskWithANumber)
 {
     listen();
     for (const Value& wrong : {Value("text"), Value(-1), Value()}) {
@@ -222,7 +222,7 @@ TEST_F(TraceMarkerConnections, AskWithANumber)
     EXPECT_THAT(logged(), ElementsAre(line, line, line));
 }
 
-TEST_F(TraceMarkerConnections, ThatAreOverAreNotAnswered)
+TEST_F(EmitterAccessConnections, ThatAreOverAreNotAnswered)
 {
     listen();
     {
@@ -237,7 +237,7 @@ TEST_F(TraceMarkerConnections, ThatAreOverAreNotAnswered)
     ASSERT_FALSE(access.open(marker.in.get()));
 }
 
-TEST_F(TraceMarkerConnections, GetTheDescriptorsWithTheirFrameHoweverMuchIsAheadOfIt)
+TEST_F(EmitterAccessConnections, GetTheDescriptorsWithTheirFrameHoweverMuchIsAheadOfIt)
 {
     // Large answers, which the client does not read until all of them wait.
     handler = [](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
@@ -259,7 +259,7 @@ TEST_F(TraceMarkerConnections, GetTheDescriptorsWithTheirFrameHoweverMuchIsAhead
     EXPECT_THAT(receive(client).numbers, ElementsAre(5));
 }
 
-TEST_F(TraceMarkerConnections, OfClientsThatReadPlainlyLoseTheDescriptorsAndNothingElse)
+TEST_F(EmitterAccessConnections, OfClientsThatReadPlainlyLoseTheDescriptorsAndNothingElse)
 {
     ASSERT_FALSE(access.open(marker.in.get()));
     handler = [](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
@@ -274,7 +274,7 @@ TEST_F(TraceMarkerConnections, OfClientsThatReadPlainlyLoseTheDescriptorsAndNoth
     EXPECT_EQ(client.readNumber(), 2);
 }
 
-TEST_F(TraceMarkerConnections, WithoutTracingAreNeverAnswered)
+TEST_F(EmitterAccessConnections, WithoutTracingAreNeverAnswered)
 {
     beforeListening = nullptr;
     listen();

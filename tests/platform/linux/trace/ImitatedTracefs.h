@@ -2,7 +2,7 @@
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
-#include "platform/linux/trace/TraceMarker.h"
+#include "platform/linux/trace/EmitterInterface.h"
 #include "support/TemporaryDirectory.h"
 
 #include <array>
@@ -25,14 +25,14 @@ namespace support {
 constexpr std::uint16_t rawDataType = 19;
 
 // A page as a 64-bit kernel makes it.
-class TracePageBuilder {
+class RingBufferPageBuilder {
 public:
     static constexpr std::size_t size = 4096;
 
-    explicit TracePageBuilder(std::uint64_t time) : time_(time) { append(time); }
+    explicit RingBufferPageBuilder(std::uint64_t time) : time_(time) { append(time); }
 
     // A record at that time, which is not before the one ahead of it.
-    TracePageBuilder& record(std::uint64_t time, std::string_view bytes)
+    RingBufferPageBuilder& record(std::uint64_t time, std::string_view bytes)
     {
         constexpr std::size_t mostWords = 28;
         advanceTo(time);
@@ -47,28 +47,28 @@ public:
         return *this;
     }
     // An event of the service's own.
-    TracePageBuilder& event(std::uint64_t time, std::uint32_t code, std::uint32_t thread = 1,
-                            std::array<std::uint64_t, 4> arguments = {})
+    RingBufferPageBuilder& event(std::uint64_t time, std::uint32_t code, std::uint32_t thread = 1,
+                                 std::array<std::uint64_t, 4> arguments = {})
     {
-        return record(time, markerBytes({.code = code, .arguments = arguments}, thread));
+        return record(time, eventBytes({.code = code, .arguments = arguments}, thread));
     }
-    static std::string markerBytes(const platform::TraceMarkerRecord& marker, std::uint32_t thread,
-                                   std::uint16_t type = rawDataType)
+    static std::string eventBytes(const platform::EmittedEvent& emitted, std::uint32_t thread,
+                                  std::uint16_t type = rawDataType)
     {
-        std::string bytes(8 + sizeof marker, '\0');
+        std::string bytes(8 + sizeof emitted, '\0');
         std::memcpy(bytes.data(), &type, sizeof type);
         std::memcpy(bytes.data() + 4, &thread, sizeof thread);
-        std::memcpy(bytes.data() + 8, &marker, sizeof marker);
+        std::memcpy(bytes.data() + 8, &emitted, sizeof emitted);
         return bytes;
     }
-    TracePageBuilder& extend(std::uint64_t by)
+    RingBufferPageBuilder& extend(std::uint64_t by)
     {
         word(30, static_cast<std::uint32_t>(by & 0x7FFFFFF));
         append(static_cast<std::uint32_t>(by >> 27));
         time_ += by;
         return *this;
     }
-    TracePageBuilder& stamp(std::uint64_t time)
+    RingBufferPageBuilder& stamp(std::uint64_t time)
     {
         word(31, static_cast<std::uint32_t>(time & 0x7FFFFFF));
         append(static_cast<std::uint32_t>(time >> 27));
@@ -76,7 +76,7 @@ public:
         return *this;
     }
     // Where an event of so many bytes was taken back.
-    TracePageBuilder& takenBack(std::uint32_t after, std::uint32_t bytes)
+    RingBufferPageBuilder& takenBack(std::uint32_t after, std::uint32_t bytes)
     {
         word(29, after);
         append(bytes);
@@ -84,17 +84,17 @@ public:
         time_ += after;
         return *this;
     }
-    TracePageBuilder& endOfData()
+    RingBufferPageBuilder& endOfData()
     {
         word(29, 0);
         return *this;
     }
-    TracePageBuilder& bytes(std::string_view any)
+    RingBufferPageBuilder& bytes(std::string_view any)
     {
         data_ += any;
         return *this;
     }
-    TracePageBuilder& missed(std::optional<std::uint64_t> count)
+    RingBufferPageBuilder& missed(std::optional<std::uint64_t> count)
     {
         missed_ = true;
         missedCount_ = count;

@@ -17,20 +17,20 @@
 namespace platform {
 
 // The descriptors for clients. They stay open as long as the service runs.
-struct TraceDescriptors {
+struct EmitterDescriptors {
     int marker = -1;
-    int page = -1; // TraceMarkerPage
+    int page = -1; // TraceSwitchPage
 };
 
 // Any thread.
-class TraceMarkerAccess {
+class EmitterAccess {
 public:
-    using Answer = std::move_only_function<void(const TraceDescriptors& descriptors)>;
+    using Answer = std::move_only_function<void(const EmitterDescriptors& descriptors)>;
 
-    TraceMarkerAccess() = default;
-    ~TraceMarkerAccess();
-    TraceMarkerAccess(const TraceMarkerAccess&) = delete;
-    TraceMarkerAccess& operator=(const TraceMarkerAccess&) = delete;
+    EmitterAccess() = default;
+    ~EmitterAccess();
+    EmitterAccess(const EmitterAccess&) = delete;
+    EmitterAccess& operator=(const EmitterAccess&) = delete;
 
     // Answers once: now or in `open`, or never if the asker is forgotten before.
     void ask(const void* asker, Answer answer);
@@ -45,7 +45,7 @@ public:
 private:
     foundation::Mutex lock_;
     std::map<const void*, Answer> waiting_ KESTO_GUARDED_BY(lock_);
-    std::optional<TraceDescriptors> descriptors_ KESTO_GUARDED_BY(lock_);
+    std::optional<EmitterDescriptors> descriptors_ KESTO_GUARDED_BY(lock_);
     FileDescriptor page_ KESTO_GUARDED_BY(lock_);
     void* mapping_ KESTO_GUARDED_BY(lock_) = nullptr;
 };
