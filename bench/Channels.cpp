@@ -131,7 +131,7 @@ double costOfDifference(const platform::ReportingSample& from, const platform::R
         / channelCount;
 }
 
-void measureSampling(const Options& options, Report& report)
+void measureSampling(const BenchOptions& options, Report& report)
 {
     const InProcessPlatform platform;
     const ChannelRoot root;
@@ -148,7 +148,7 @@ void measureSampling(const Options& options, Report& report)
         options, "sampling channels", [&] { return costOfSample(channels, subscribed); },
         [&] { return costOfReading(files); }, [&] { return costOfDifference(before, after); });
     report.add({fmt::format("a channel in a snapshot of {}", channelCount), "ns", sampling[0],
-                Peer{"reading the files in a loop", sampling[1]}, Target::ratioAtMost(2)});
+                PeerFigure{"reading the files in a loop", sampling[1]}, Target::ratioAtMost(2)});
     report.add({"how a channel changed, put into words", "ns", sampling[2], std::nullopt, Target::figureAtMost(2000)});
 }
 
@@ -240,7 +240,7 @@ private:
     kesto::StateChannel state_;
 };
 
-void measurePublishing(const Options& options, Report& report)
+void measurePublishing(const BenchOptions& options, Report& report)
 {
     Publishing publishing;
     const auto costs = compete(
@@ -252,12 +252,12 @@ void measurePublishing(const Options& options, Report& report)
         {"recording into a histogram, for the caller", "ns", costs[1], std::nullopt, Target::figureAtMost(1000)});
     report.add({"entering a state, for the caller", "ns", costs[2], std::nullopt, Target::figureAtMost(1000)});
     report.add({"publishing 1,000 values a second on 10 channels, all in all", "ns", costs[3],
-                Peer{"a file written for each", costs[4]}, Target::figureAtMost(1000)});
+                PeerFigure{"a file written for each", costs[4]}, Target::figureAtMost(1000)});
 }
 
 } // namespace
 
-void measureChannels(const Options& options, Report& report)
+void measureChannels(const BenchOptions& options, Report& report)
 {
     measureSampling(options, report);
     measurePublishing(options, report);

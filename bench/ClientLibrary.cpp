@@ -31,9 +31,9 @@ void check(kesto::Status status)
 }
 
 // A program that reports, with the sample session started.
-class Reporter {
+class LibraryReporter {
 public:
-    explicit Reporter(const ServiceProcess& service)
+    explicit LibraryReporter(const ServiceProcess& service)
     {
         (void)service.connect(); // once it listens
         kesto::Options options;
@@ -125,14 +125,14 @@ template <typename Send> double systemCallsOf(Send send)
 
 // --- Time
 
-struct Times {
+struct SendTimes {
     std::vector<double> medians;
     std::vector<double> slowest; // of a thousand
 };
 
 // Nanoseconds of single calls of `send`, between which everything is prepared by `prepare` and `settle`.
 template <typename Prepare, typename Send, typename Settle>
-void time(Times& times, Prepare prepare, Send send, Settle settle)
+void time(SendTimes& times, Prepare prepare, Send send, Settle settle)
 {
     constexpr double allButOneOfAThousand = 0.999;
     std::vector<double> each;
@@ -160,10 +160,10 @@ ChildProcess runSink(const SocketPair& sockets)
 
 } // namespace
 
-void measureClientLibrary(const Options& options, Report& report)
+void measureClientLibrary(const BenchOptions& options, Report& report)
 {
     const ServiceProcess service(options);
-    Reporter reporter(service);
+    LibraryReporter reporter(service);
     const std::string what = "libkesto's send, caller's side";
 
     SocketPair sockets;
@@ -171,9 +171,9 @@ void measureClientLibrary(const Options& options, Report& report)
     const std::string bytes = sampleFrame();
     const auto sendToSocket = [&] { writeAll(sockets.client.get(), bytes); };
 
-    Times ours;
-    Times built;
-    Times theirs;
+    SendTimes ours;
+    SendTimes built;
+    SendTimes theirs;
     std::vector<double> calls;
     std::vector<double> theirCalls;
     for (int round = 0; round < options.rounds; ++round) {
@@ -196,9 +196,9 @@ void measureClientLibrary(const Options& options, Report& report)
     }
     clearProgress();
     const std::string socket = "send(2) of as many bytes";
-    report.add({what + ", median", "ns", ours.medians, Peer{socket, theirs.medians}, Target::figureAtMost(1000)});
-    report.add({what + ", p99.9", "ns", ours.slowest, Peer{socket, theirs.slowest}, Target::figureAtMost(1000)});
-    report.add({fmt::format("{}, system calls of {}", what, burst), "", calls, Peer{socket, theirCalls},
+    report.add({what + ", median", "ns", ours.medians, PeerFigure{socket, theirs.medians}, Target::figureAtMost(1000)});
+    report.add({what + ", p99.9", "ns", ours.slowest, PeerFigure{socket, theirs.slowest}, Target::figureAtMost(1000)});
+    report.add({fmt::format("{}, system calls of {}", what, burst), "", calls, PeerFigure{socket, theirCalls},
                 Target::figureAtMost(0)});
     report.add({"building the message and sending it, median", "ns", built.medians});
 }

@@ -85,7 +85,7 @@ double costOfList(const std::vector<foundation::Dictionary>& messages)
 
 } // namespace
 
-void measureDecoding(const Options& options, Report& report)
+void measureDecoding(const BenchOptions& options, Report& report)
 {
     const InProcessPlatform platform;
     const std::string encoded = encodedSample();
@@ -93,16 +93,16 @@ void measureDecoding(const Options& options, Report& report)
         options, "decoding", [&] { return costOfDecoder(encoded); }, [&] { return costOfStreaming(encoded); },
         [&] { return costOfTree(encoded); });
     const std::string what = fmt::format("decoding the message, {} B of CBOR", encoded.size());
-    report.add({what, "ns", decoding[0], Peer{"libcbor, tree", decoding[2]}});
-    report.add({what, "ns", decoding[0], Peer{"libcbor, stream, builds nothing", decoding[1]}});
+    report.add({what, "ns", decoding[0], PeerFigure{"libcbor, tree", decoding[2]}});
+    report.add({what, "ns", decoding[0], PeerFigure{"libcbor, stream, builds nothing", decoding[1]}});
 
     std::vector<foundation::Dictionary> messages;
     for (std::uint32_t each = 1; each <= keptEach; ++each)
         messages.push_back(sampleMessage(numberMark + each));
     const auto keeping =
         compete(options, "keeping", [&] { return costOfStore(messages); }, [&] { return costOfList(messages); });
-    report.add(
-        {"keeping a payload that was compared", "ns", keeping[0], Peer{"encoded into a list of strings", keeping[1]}});
+    report.add({"keeping a payload that was compared", "ns", keeping[0],
+                PeerFigure{"encoded into a list of strings", keeping[1]}});
 }
 
 } // namespace bench

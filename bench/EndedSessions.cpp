@@ -87,7 +87,7 @@ private:
 
 } // namespace
 
-void measureEndedSessions(const Options& options, Report& report)
+void measureEndedSessions(const BenchOptions& options, Report& report)
 {
     std::deque<ServiceProcess> services;
     std::deque<Player> players;
@@ -109,7 +109,7 @@ void measureEndedSessions(const Options& options, Report& report)
     clearProgress();
     report.add({fmt::format("resident {} s after {} sessions of {} changes of volume ended", patience.count(),
                             reporters.size(), changeCount),
-                "MB", after, Peer{"before them", before}});
+                "MB", after, PeerFigure{"before them", before}});
 }
 
 } // namespace bench

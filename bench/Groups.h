@@ -6,23 +6,23 @@
 
 namespace bench {
 
-void measureRoundTrip(const Options& options, Report& report);
-void measurePipeline(const Options& options, Report& report);
-void measureStored(const Options& options, Report& report);
-void measureSession(const Options& options, Report& report);
-void measureSessionEnd(const Options& options, Report& report);
-void measureEndedSessions(const Options& options, Report& report);
-void measureLongStop(const Options& options, Report& report);
-void measureLookup(const Options& options, Report& report);
-void measureNotification(const Options& options, Report& report);
-void measureIdle(const Options& options, Report& report);
-void measureStart(const Options& options, Report& report);
-void measureLogStatement(const Options& options, Report& report);
-void measureClientLibrary(const Options& options, Report& report);
-void measureChannels(const Options& options, Report& report);
-void measureDecoding(const Options& options, Report& report);
-void measureRecord(const Options& options, Report& report);
-void measureTrace(const Options& options, Report& report);
-void measureTracing(const Options& options, Report& report);
+void measureRoundTrip(const BenchOptions& options, Report& report);
+void measurePipeline(const BenchOptions& options, Report& report);
+void measureStored(const BenchOptions& options, Report& report);
+void measureGrowingSession(const BenchOptions& options, Report& report);
+void measureSessionEnd(const BenchOptions& options, Report& report);
+void measureEndedSessions(const BenchOptions& options, Report& report);
+void measureLongStop(const BenchOptions& options, Report& report);
+void measureLookup(const BenchOptions& options, Report& report);
+void measureNotification(const BenchOptions& options, Report& report);
+void measureIdle(const BenchOptions& options, Report& report);
+void measureStart(const BenchOptions& options, Report& report);
+void measureLogStatement(const BenchOptions& options, Report& report);
+void measureClientLibrary(const BenchOptions& options, Report& report);
+void measureChannels(const BenchOptions& options, Report& report);
+void measureDecoding(const BenchOptions& options, Report& report);
+void measureDiagnosticsRecord(const BenchOptions& options, Report& report);
+void measureTraceEnd(const BenchOptions& options, Report& report);
+void measureTraceEventCost(const BenchOptions& options, Report& report);
 
 } // namespace bench

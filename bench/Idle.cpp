@@ -17,7 +17,7 @@ constexpr std::chrono::seconds duration(10);
 
 class IdleService {
 public:
-    explicit IdleService(const Options& options) : service_(options)
+    explicit IdleService(const BenchOptions& options) : service_(options)
     {
         for (int client = 0; client < clientCount; ++client)
             clients_.push_back(service_.connectWithSession());
@@ -64,7 +64,7 @@ template <typename Processes> void end(const Processes& processes, Idleness& idl
 
 } // namespace
 
-void measureIdle(const Options& options, Report& report)
+void measureIdle(const BenchOptions& options, Report& report)
 {
     showProgress(
         fmt::format("idle: {} services, {} clients each, {} s", options.rounds, clientCount, duration.count()));
@@ -86,7 +86,7 @@ void measureIdle(const Options& options, Report& report)
     clearProgress();
 
     const auto peer = [&](const std::vector<double>& figures) {
-        return daemons.empty() ? std::nullopt : std::optional(Peer{"dbus-daemon", figures});
+        return daemons.empty() ? std::nullopt : std::optional(PeerFigure{"dbus-daemon", figures});
     };
     const std::string what = fmt::format("idle with {} connected clients", clientCount);
     report.add({what + fmt::format(", wake-ups in {} s", duration.count()), "", ours.wakeUps, peer(theirs.wakeUps),

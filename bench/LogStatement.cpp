@@ -19,7 +19,7 @@ std::string shownList(const std::vector<std::int64_t>& reporterIDs)
 
 } // namespace
 
-void measureLogStatement(const Options& options, Report& report)
+void measureLogStatement(const BenchOptions& options, Report& report)
 {
     const InProcessPlatform platform;
     const std::vector<std::int64_t> reporterIDs{1, 2, 3};
@@ -40,7 +40,7 @@ void measureLogStatement(const Options& options, Report& report)
                          static_cast<long long>(reporterIDs.front()));
             });
         });
-    report.add({"a log statement below the threshold", "ns", costs[0], Peer{"syslog(3) below its mask", costs[1]},
+    report.add({"a log statement below the threshold", "ns", costs[0], PeerFigure{"syslog(3) below its mask", costs[1]},
                 Target::figureAtMost(2)});
 }
 

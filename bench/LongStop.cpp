@@ -22,7 +22,7 @@ double millisecondsOfRoundTrip(RawClient& client)
 
 } // namespace
 
-void measureLongStop(const Options& options, Report& report)
+void measureLongStop(const BenchOptions& options, Report& report)
 {
     const ServiceProcess service(options, "used = []", ServiceProcess::Build::Internal);
     RawClient other = service.makeClient();
@@ -41,7 +41,7 @@ void measureLongStop(const Options& options, Report& report)
     }
     clearProgress();
     report.add({fmt::format("longest wait of another client, {} messages being stopped", messageCount), "ms", longest,
-                Peer{"without it", usual}});
+                PeerFigure{"without it", usual}});
 }
 
 } // namespace bench

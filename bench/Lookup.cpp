@@ -62,7 +62,7 @@ double costAfterPause(CrowdedService& service, std::int64_t clients)
 
 } // namespace
 
-void measureLookup(const Options& options, Report& report)
+void measureLookup(const BenchOptions& options, Report& report)
 {
     constexpr std::int64_t clients = 10'000;
     constexpr std::size_t count = clients * sessionsEach;
@@ -83,9 +83,9 @@ void measureLookup(const Options& options, Report& report)
         [&] { return costAfterPause(crowd, clients); }, [&] { return costAfterPause(single, 1); },
         [&] { return costOf(crowd, everySession); });
     const std::string peer = "with one client";
-    report.add({what + ", again and again", "ns", costs[0], Peer{peer, costs[1]}, Target::ratioAtMost(2)});
-    report.add({what + ", after a pause", "ns", costs[2], Peer{peer, costs[3]}, Target::ratioAtMost(2)});
-    report.add({what + ", all in no order", "ns", costs[4], Peer{peer + ", again and again", costs[1]}});
+    report.add({what + ", again and again", "ns", costs[0], PeerFigure{peer, costs[1]}, Target::ratioAtMost(2)});
+    report.add({what + ", after a pause", "ns", costs[2], PeerFigure{peer, costs[3]}, Target::ratioAtMost(2)});
+    report.add({what + ", all in no order", "ns", costs[4], PeerFigure{peer + ", again and again", costs[1]}});
 }
 
 } // namespace bench

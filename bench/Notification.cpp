@@ -7,7 +7,7 @@
 
 namespace bench {
 
-void measureNotification(const Options& options, Report& report)
+void measureNotification(const BenchOptions& options, Report& report)
 {
     constexpr std::int64_t clients = 1'000;
     constexpr std::string_view ringerSwitch = "com.quarn.halden.ringerstate";

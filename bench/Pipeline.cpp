@@ -17,7 +17,7 @@ template <typename Client> double rateOf(Client& client, std::size_t count)
 
 } // namespace
 
-void measurePipeline(const Options& options, Report& report)
+void measurePipeline(const BenchOptions& options, Report& report)
 {
     constexpr std::size_t count = 50'000;
     const ServiceProcess service(options);
@@ -38,8 +38,8 @@ void measurePipeline(const Options& options, Report& report)
             return rateOf(client, count);
         },
         [&] { return rateOf(busClient, count); }, [&] { return rateOf(rawBusClient, count); });
-    report.add({what, "/s", rates[0], Peer{"sd-bus at both ends", rates[1]}, Target::ratioAtLeast(5)});
-    report.add({what, "/s", rates[0], Peer{"sd-bus server, raw client", rates[2]}, Target::ratioAtLeast(5)});
+    report.add({what, "/s", rates[0], PeerFigure{"sd-bus at both ends", rates[1]}, Target::ratioAtLeast(5)});
+    report.add({what, "/s", rates[0], PeerFigure{"sd-bus server, raw client", rates[2]}, Target::ratioAtLeast(5)});
 }
 
 } // namespace bench

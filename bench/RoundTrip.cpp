@@ -40,7 +40,7 @@ template <typename Client> Contestant roundTripsOf(Client& client)
 
 } // namespace
 
-void measureRoundTrip(const Options& options, Report& report)
+void measureRoundTrip(const BenchOptions& options, Report& report)
 {
     const ServiceProcess service(options);
     RawClient client = service.makeClient();
@@ -62,9 +62,10 @@ void measureRoundTrip(const Options& options, Report& report)
         const std::string what = fmt::format("sendMessage round trip, {}", how);
         const auto times = compete(options, what, roundTripsOf(client), roundTripsOf(pingPongClient),
                                    roundTripsOf(busClient), roundTripsOf(rawBusClient));
-        report.add({what, "us", times[0], Peer{"Unix-socket ping-pong", times[1]}, Target::ratioAtMost(1.6)});
-        report.add({what, "us", times[0], Peer{"sd-bus at both ends", times[2]}, Target::ratioAtMost(1.0 / 3)});
-        report.add({what, "us", times[0], Peer{"sd-bus server, raw client", times[3]}, Target::ratioAtMost(1.0 / 3)});
+        report.add({what, "us", times[0], PeerFigure{"Unix-socket ping-pong", times[1]}, Target::ratioAtMost(1.6)});
+        report.add({what, "us", times[0], PeerFigure{"sd-bus at both ends", times[2]}, Target::ratioAtMost(1.0 / 3)});
+        report.add(
+            {what, "us", times[0], PeerFigure{"sd-bus server, raw client", times[3]}, Target::ratioAtMost(1.0 / 3)});
     };
     measure("as scheduled");
     const OneProcessor processor{service.identifier(), pingPong.identifier(), bus.identifier(), rawBus.identifier()};

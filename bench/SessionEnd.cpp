@@ -6,6 +6,7 @@
 #include "support/ChildProcess.h"
 #include "support/InProcessPlatform.h"
 #include "support/SampleMessage.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cstdio>
 #include <fmt/format.h>
@@ -72,7 +73,7 @@ template <typename Work> Contestant millisecondsOf(Work work)
     };
 }
 
-void measureAnalysis(const Options& options, Report& report)
+void measureAnalysis(const BenchOptions& options, Report& report)
 {
     session::MessageStore store(session::StorageBudget::service());
     sendMessages([&](const auto& message) { use(store.record(sampleCategory, sampleType, message)); });
@@ -99,7 +100,7 @@ std::size_t allocated()
 }
 
 // Of a session in which nothing but the volume changes: each message ends a stretch.
-void measureVolumeEvents(const Options& options, Report& report)
+void measureVolumeEvents(const BenchOptions& options, Report& report)
 {
     constexpr int changeCount = 200'000;
     session::MessageStore store(session::StorageBudget::service());
@@ -125,7 +126,7 @@ void measureVolumeEvents(const Options& options, Report& report)
     }
     report.add({"volume events made a second", "", perSecond});
     report.add(
-        {"memory of a volume event", "B", bytes, Peer{"what is paid for it", paidBytes}, Target::ratioAtMost(1)});
+        {"memory of a volume event", "B", bytes, PeerFigure{"what is paid for it", paidBytes}, Target::ratioAtMost(1)});
 }
 
 // The values, handed to RapidJSON's writer.
@@ -163,17 +164,17 @@ void writeWithRapidJson(const std::vector<foundation::Dictionary>& messages, con
     writer.EndArray();
 }
 
-void measureFile(const Options& options, Report& report, const KestoReportingSession& session,
+void measureFile(const BenchOptions& options, Report& report, const KestoReportingSession& session,
                  const std::filesystem::path& directory)
 {
     const auto messages = session.nestedAggregatedPayloadData().value();
     const auto times = compete(options, "summary file", millisecondsOf([&] { session.writeSummaryJson(); }),
                                millisecondsOf([&] { writeWithRapidJson(messages, directory / "rapidjson.json"); }));
     report.add({fmt::format("summary file of {} messages", messageCount), "ms", times[0],
-                Peer{"RapidJSON's pretty writer", times[1]}, Target::ratioAtMost(1.3)});
+                PeerFigure{"RapidJSON's pretty writer", times[1]}, Target::ratioAtMost(1.3)});
 }
 
-void measureEvent(const Options& options, Report& report, const KestoReportingSession& session)
+void measureEvent(const BenchOptions& options, Report& report, const KestoReportingSession& session)
 {
     const foundation::Dictionary summary = session.createSummaryEventForSession().value();
     const auto copyText = [&summary] {
@@ -187,7 +188,7 @@ void measureEvent(const Options& options, Report& report, const KestoReportingSe
         compete(options, "summary event", millisecondsOf([&] { use(session.createSummaryEventForSession()); }),
                 millisecondsOf(copyText));
     report.add({fmt::format("summary event of {} messages", messageCount), "ms", times[0],
-                Peer{"copy of its text", times[1]}, Target::ratioAtMost(3)});
+                PeerFigure{"copy of its text", times[1]}, Target::ratioAtMost(3)});
 }
 
 // Memory of this process, in megabytes: "VmRSS", or "VmHWM" for the maximum since `forgetMostMemory`.
@@ -205,7 +206,7 @@ void forgetMostMemory()
     std::ofstream("/proc/self/clear_refs") << "5";
 }
 
-void measureMemory(const Options& options, Report& report)
+void measureMemory(const BenchOptions& options, Report& report)
 {
     std::vector<double> more;
     std::vector<double> texts;
@@ -221,15 +222,15 @@ void measureMemory(const Options& options, Report& report)
         more.push_back(memory("VmHWM") - before);
     }
     clearProgress();
-    report.add({"memory while it ends, over before", "MB", more, Peer{"text of the summary event", texts},
+    report.add({"memory while it ends, over before", "MB", more, PeerFigure{"text of the summary event", texts},
                 Target::ratioAtMost(1.5)});
 }
 
 } // namespace
 
-void measureSessionEnd(const Options& options, Report& report)
+void measureSessionEnd(const BenchOptions& options, Report& report)
 {
-    const TemporaryDirectory directory;
+    const support::TemporaryDirectory directory;
     platform::LinuxFileSystem files(directory.path());
     const InProcessPlatform platform(&files);
     measureMemory(options, report);

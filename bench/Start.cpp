@@ -6,7 +6,7 @@
 
 namespace bench {
 
-void measureStart(const Options& options, Report& report)
+void measureStart(const BenchOptions& options, Report& report)
 {
     const std::string what = "start of the process to the first answer";
     std::vector<Contestant> contestants;
@@ -24,7 +24,8 @@ void measureStart(const Options& options, Report& report)
             return nanosecondsSince(start) / 1e6;
         });
     const auto times = compete(options, what, contestants);
-    report.add({what, "ms", times[0], times.size() > 1 ? std::optional(Peer{"dbus-daemon", times[1]}) : std::nullopt,
+    report.add({what, "ms", times[0],
+                times.size() > 1 ? std::optional(PeerFigure{"dbus-daemon", times[1]}) : std::nullopt,
                 Target::figureAtMost(50)});
 }
 

@@ -9,7 +9,7 @@
 
 namespace bench {
 
-void measureStored(const Options& options, Report& report)
+void measureStored(const BenchOptions& options, Report& report)
 {
     const std::string what = "sendMessage pipelined, two events stored";
     const ServiceProcess service(options, "used = [\"com.quarn.*\"]\nmaximum_size_mb = 4096");
@@ -29,7 +29,7 @@ void measureStored(const Options& options, Report& report)
             continue;
         }
         const auto rates = compete(options, name, measureService, [&] { return (*journal)->rate(count); });
-        report.add({name, "/s", rates[0], Peer{"journald, one entry stored", rates[1]}, Target::ratioAtLeast(3)});
+        report.add({name, "/s", rates[0], PeerFigure{"journald, one entry stored", rates[1]}, Target::ratioAtLeast(3)});
     }
 }
 

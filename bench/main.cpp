@@ -14,31 +14,31 @@
 namespace bench {
 namespace {
 
-struct Group {
+struct MeasurementGroup {
     std::string_view name;
     std::string_view what;
-    void (*measure)(const Options&, Report&);
+    void (*measure)(const BenchOptions&, Report&);
 };
 
 constexpr std::array groups{
-    Group{"roundtrip", "waiting for the answer to a message", measureRoundTrip},
-    Group{"pipeline", "messages a second, none stored", measurePipeline},
-    Group{"stored", "messages a second that become stored events", measureStored},
-    Group{"session", "recording a million messages: time and memory", measureSession},
-    Group{"end", "the end of a session of a million messages", measureSessionEnd},
-    Group{"ended", "the memory that stays of sessions that ended", measureEndedSessions},
-    Group{"starving", "what others wait while a long session ends", measureLongStop},
-    Group{"lookup", "finding a session among 10,000 clients", measureLookup},
-    Group{"notification", "telling all sessions that a setting changed", measureNotification},
-    Group{"idle", "wake-ups and memory with nothing to do", measureIdle},
-    Group{"start", "from starting the process to its first answer", measureStart},
-    Group{"log", "a log statement below the threshold", measureLogStatement},
-    Group{"library", "sending with libkesto, as its caller sees it", measureClientLibrary},
-    Group{"channels", "driver channels: sampled, compared, published", measureChannels},
-    Group{"decoding", "CBOR, and keeping a payload", measureDecoding},
-    Group{"record", "the diagnostics record to bytes and back", measureRecord},
-    Group{"trace", "pairing the events of a trace, and its stop", measureTrace},
-    Group{"tracing", "emitting trace events, and taking the kernel's pages apart", measureTracing},
+    MeasurementGroup{"roundtrip", "waiting for the answer to a message", measureRoundTrip},
+    MeasurementGroup{"pipeline", "messages a second, none stored", measurePipeline},
+    MeasurementGroup{"stored", "messages a second that become stored events", measureStored},
+    MeasurementGroup{"session", "recording a million messages: time and memory", measureGrowingSession},
+    MeasurementGroup{"end", "the end of a session of a million messages", measureSessionEnd},
+    MeasurementGroup{"ended", "the memory that stays of sessions that ended", measureEndedSessions},
+    MeasurementGroup{"starving", "what others wait while a long session ends", measureLongStop},
+    MeasurementGroup{"lookup", "finding a session among 10,000 clients", measureLookup},
+    MeasurementGroup{"notification", "telling all sessions that a setting changed", measureNotification},
+    MeasurementGroup{"idle", "wake-ups and memory with nothing to do", measureIdle},
+    MeasurementGroup{"start", "from starting the process to its first answer", measureStart},
+    MeasurementGroup{"log", "a log statement below the threshold", measureLogStatement},
+    MeasurementGroup{"library", "sending with libkesto, as its caller sees it", measureClientLibrary},
+    MeasurementGroup{"channels", "driver channels: sampled, compared, published", measureChannels},
+    MeasurementGroup{"decoding", "CBOR, and keeping a payload", measureDecoding},
+    MeasurementGroup{"record", "the diagnostics record to bytes and back", measureDiagnosticsRecord},
+    MeasurementGroup{"trace", "pairing the events of a trace, and its stop", measureTraceEnd},
+    MeasurementGroup{"tracing", "emitting trace events, and taking the kernel's pages apart", measureTraceEventCost},
 };
 
 void printHelp()
@@ -51,13 +51,13 @@ void printHelp()
                "  --json FILE        write all figures, round by round, to the file, too\n"
                "  --service PROGRAM  the service to measure; {} by default\n"
                "  --help             this text\n\nGroups:\n",
-               Options::fewestRounds, Options().rounds, KESTO_BENCH_SERVICE);
-    for (const Group& group : groups)
+               BenchOptions::fewestRounds, BenchOptions().rounds, KESTO_BENCH_SERVICE);
+    for (const MeasurementGroup& group : groups)
         fmt::print("  {:<12} {}\n", group.name, group.what);
 }
 
 // Nothing if the program must end now; `exitStatus` is then its exit status.
-std::optional<Options> parse(int argumentCount, char** arguments, int& status)
+std::optional<BenchOptions> parse(int argumentCount, char** arguments, int& status)
 {
     constexpr std::array<option, 6> known{{{"filter", required_argument, nullptr, 'f'},
                                            {"rounds", required_argument, nullptr, 'r'},
@@ -66,12 +66,12 @@ std::optional<Options> parse(int argumentCount, char** arguments, int& status)
                                            {"help", no_argument, nullptr, 'h'},
                                            {}}};
     constexpr int wrongUsage = 2;
-    Options options;
+    BenchOptions options;
     options.service = KESTO_BENCH_SERVICE;
     for (int given = 0; (given = ::getopt_long(argumentCount, arguments, "", known.data(), nullptr)) != -1;) {
         switch (given) {
         case 'f': options.filter = optarg; break;
-        case 'r': options.rounds = std::max(std::atoi(optarg), Options::fewestRounds); break;
+        case 'r': options.rounds = std::max(std::atoi(optarg), BenchOptions::fewestRounds); break;
         case 'j': options.json = optarg; break;
         case 's': options.service = std::filesystem::absolute(optarg); break;
         case 'h': printHelp(); return std::nullopt;
@@ -91,11 +91,11 @@ bool writeJson(const Report& report, const std::filesystem::path& path)
     return false;
 }
 
-int run(const Options& options)
+int run(const BenchOptions& options)
 {
     Report report;
     bool isComplete = true;
-    for (const Group& group : groups) {
+    for (const MeasurementGroup& group : groups) {
         if (group.name.find(options.filter) == std::string_view::npos)
             continue;
         try {

@@ -3,6 +3,7 @@
 
 #include "peers/BusPeer.h"
 #include "support/ChildProcess.h"
+#include "support/TemporaryDirectory.h"
 
 #include <filesystem>
 
@@ -17,7 +18,7 @@ public:
     [[nodiscard]] Bus connect() const;
 
 private:
-    TemporaryDirectory directory_;
+    support::TemporaryDirectory directory_;
     ChildProcess process_;
 };
 

@@ -151,13 +151,13 @@ private:
     std::unique_ptr<sd_journal, CloseJournal> journal_;
 };
 
-struct Answer {
+struct JournalAnswer {
     double rate = 0;
     std::array<char, 256> problem{}; // empty on success
 
-    static Answer about(std::string_view problem)
+    static JournalAnswer about(std::string_view problem)
     {
-        Answer answer;
+        JournalAnswer answer;
         problem.copy(answer.problem.data(), answer.problem.size() - 1);
         return answer;
     }
@@ -176,7 +176,7 @@ double measureRate(Journal& journal, std::uint32_t& number, std::size_t count)
     return static_cast<double>(count) / elapsed * 1e9;
 }
 
-void answer(int channel, const Answer& answer)
+void answer(int channel, const JournalAnswer& answer)
 {
     writeAll(channel, {reinterpret_cast<const char*>(&answer), sizeof answer});
 }
@@ -204,7 +204,7 @@ void serve(int channel, const fs::path& directory)
 // Throws the error that happened in the namespace.
 double readAnswer(int channel)
 {
-    Answer answer;
+    JournalAnswer answer;
     if (!readAll(channel, reinterpret_cast<char*>(&answer), sizeof answer))
         throw std::runtime_error("the process of journald ended");
     if (answer.problem.front() != '\0')
@@ -225,7 +225,7 @@ std::expected<std::unique_ptr<JournalPeer>, std::string> JournalPeer::start()
         try {
             serve(channel, peer->directory_.path());
         } catch (const std::exception& problem) {
-            answer(channel, Answer::about(problem.what()));
+            answer(channel, JournalAnswer::about(problem.what()));
         }
     });
     peer->channel_.server = {};

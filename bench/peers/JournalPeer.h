@@ -4,6 +4,7 @@
 
 #include "support/ChildProcess.h"
 #include "support/RawClient.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cstddef>
 #include <expected>
@@ -24,7 +25,7 @@ public:
 private:
     JournalPeer() = default;
 
-    TemporaryDirectory directory_;
+    support::TemporaryDirectory directory_;
     SocketPair channel_; // to the process in the namespace
     ChildProcess process_;
 };

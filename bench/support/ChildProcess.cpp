@@ -107,20 +107,6 @@ void ChildProcess::end()
     identifier_ = 0;
 }
 
-TemporaryDirectory::TemporaryDirectory()
-{
-    std::string pattern = fs::temp_directory_path() / "kesto-bench-XXXXXX";
-    if (::mkdtemp(pattern.data()) == nullptr)
-        throw std::system_error(errno, std::generic_category(), pattern);
-    path_ = pattern;
-}
-
-TemporaryDirectory::~TemporaryDirectory()
-{
-    std::error_code error;
-    fs::remove_all(path_, error);
-}
-
 OneProcessor::OneProcessor(std::initializer_list<pid_t> others) : processes_(others)
 {
     processes_.push_back(::getpid());

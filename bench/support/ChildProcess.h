@@ -38,19 +38,6 @@ private:
     pid_t identifier_ = 0;
 };
 
-// A directory that is removed, with its content, at the end.
-class TemporaryDirectory {
-public:
-    TemporaryDirectory();
-    ~TemporaryDirectory();
-    TemporaryDirectory(const TemporaryDirectory&) = delete;
-    TemporaryDirectory& operator=(const TemporaryDirectory&) = delete;
-    [[nodiscard]] const std::filesystem::path& path() const { return path_; }
-
-private:
-    std::filesystem::path path_;
-};
-
 // Keeps this process and others, with all their threads, on one processor as long as it lives: measurements then show
 // work and switching, without the time that a sleeping processor needs to wake up.
 class OneProcessor {

@@ -28,7 +28,7 @@ double Series::median() const
     return bench::median(figures_);
 }
 
-std::vector<Series> compete(const Options& options, std::string_view what, std::span<const Contestant> contestants)
+std::vector<Series> compete(const BenchOptions& options, std::string_view what, std::span<const Contestant> contestants)
 {
     std::vector<std::vector<double>> figures(contestants.size());
     for (int round = 0; round <= options.rounds; ++round) {

@@ -17,7 +17,7 @@
 
 namespace bench {
 
-struct Options {
+struct BenchOptions {
     static constexpr int fewestRounds = 5;
     int rounds = 7;
     std::string filter; // groups whose name contains it are measured
@@ -41,10 +41,10 @@ private:
 using Contestant = std::function<double()>;
 
 // Lets the contestants measure in turns, after a round that does not count; the figures in their order.
-[[nodiscard]] std::vector<Series> compete(const Options& options, std::string_view what,
+[[nodiscard]] std::vector<Series> compete(const BenchOptions& options, std::string_view what,
                                           std::span<const Contestant> contestants);
 template <std::invocable... Each>
-[[nodiscard]] std::vector<Series> compete(const Options& options, std::string_view what, Each... each)
+[[nodiscard]] std::vector<Series> compete(const BenchOptions& options, std::string_view what, Each... each)
 {
     const std::array all{Contestant(std::move(each))...};
     return compete(options, what, std::span<const Contestant>(all));

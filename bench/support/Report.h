@@ -26,7 +26,7 @@ struct Target {
     static constexpr Target ratioAtLeast(double limit) { return {Of::Ratio, Bound::AtLeast, limit}; }
 };
 
-struct Peer {
+struct PeerFigure {
     std::string name;
     Series figure;
 };
@@ -35,7 +35,7 @@ struct Row {
     std::string what;
     std::string_view unit; // of both figures
     Series figure;
-    std::optional<Peer> peer = {};
+    std::optional<PeerFigure> peer = {};
     std::optional<Target> target = {};
 
     // The figure over the peer's.

@@ -18,7 +18,7 @@ constexpr std::string_view socketName = "kesto";
 
 } // namespace
 
-ServiceProcess::ServiceProcess(const Options& options, std::string_view analytics, Build build)
+ServiceProcess::ServiceProcess(const BenchOptions& options, std::string_view analytics, Build build)
 {
     const auto& root = directory_.path();
     std::vector<std::string> environment{fmt::format("KESTO_SERVICE_NAME={}", socketName)};

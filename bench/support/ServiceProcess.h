@@ -5,6 +5,7 @@
 #include "support/ChildProcess.h"
 #include "support/Harness.h"
 #include "support/RawClient.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cstdint>
 #include <string>
@@ -17,7 +18,7 @@ public:
     enum class Build : std::uint8_t { Customer, Internal };
 
     // `analytics` is the content of analytics.toml. Returns before the service listens.
-    explicit ServiceProcess(const Options& options, std::string_view analytics = "used = []",
+    explicit ServiceProcess(const BenchOptions& options, std::string_view analytics = "used = []",
                             Build build = Build::Customer);
 
     [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
@@ -30,7 +31,7 @@ public:
     [[nodiscard]] RawClient makeClient() const;
 
 private:
-    TemporaryDirectory directory_;
+    support::TemporaryDirectory directory_;
     ChildProcess process_;
 };
 

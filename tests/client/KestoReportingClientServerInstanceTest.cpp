@@ -38,7 +38,7 @@ std::string described(std::int64_t reporterID, bool started)
         + ",serviceName=(null),ownerPid=1001,HostApplicationDisplayID=Unknown,started=" + (started ? "1\"" : "0\"");
 }
 
-class ClientTest : public testing::Test {
+class ClientServerInstanceTest : public testing::Test {
 protected:
     ServiceHarness harness;
     TestClient player = harness.connect("player");
@@ -60,7 +60,7 @@ protected:
 
 // --- making
 
-TEST_F(ClientTest, IsMadeWithItsProcessAndNoSessions)
+TEST_F(ClientServerInstanceTest, IsMadeWithItsProcessAndNoSessions)
 {
     const auto client = std::make_shared<KestoReportingClientServerInstance>(17, harness.service);
     EXPECT_EQ(client->processIdentifier(), 17);
@@ -70,7 +70,7 @@ TEST_F(ClientTest, IsMadeWithItsProcessAndNoSessions)
     EXPECT_THAT(lines(), ElementsAre(IsLine(Default, "kerc", "new client with pid 17")));
 }
 
-TEST_F(ClientTest, SaysThatItGoes)
+TEST_F(ClientServerInstanceTest, SaysThatItGoes)
 {
     std::make_shared<KestoReportingClientServerInstance>(17, harness.service);
     EXPECT_THAT(lines(),
@@ -78,7 +78,7 @@ TEST_F(ClientTest, SaysThatItGoes)
                             IsLine(Default, "kerc", "dealloc 17 from the server client list")));
 }
 
-TEST_F(ClientTest, DoesNothingOnTheCallersThreadButSubmit)
+TEST_F(ClientServerInstanceTest, DoesNothingOnTheCallersThreadButSubmit)
 {
     for (const auto& [method, arguments] :
          std::vector<std::pair<Method, Array>>{{CreateReportingSession, {42}},
@@ -102,7 +102,7 @@ TEST_F(ClientTest, DoesNothingOnTheCallersThreadButSubmit)
     }
 }
 
-TEST_F(ClientTest, ServesCallsInTheOrderInWhichTheyCame)
+TEST_F(ClientServerInstanceTest, ServesCallsInTheOrderInWhichTheyCame)
 {
     player.submit(CreateReportingSession, {42});
     player.submit(SetServiceType, {4, 42});
@@ -111,7 +111,7 @@ TEST_F(ClientTest, ServesCallsInTheOrderInWhichTheyCame)
     EXPECT_EQ(player.answersTo(asked), answeredOnce({null, 4}));
 }
 
-TEST_F(ClientTest, SaysWhatIsCalledBeforeItMarksIt)
+TEST_F(ClientServerInstanceTest, SaysWhatIsCalledBeforeItMarksIt)
 {
     struct Row {
         Method method;
@@ -152,7 +152,7 @@ TEST_F(ClientTest, SaysWhatIsCalledBeforeItMarksIt)
 
 // --- create
 
-TEST_F(ClientTest, CreatesASessionOwnedByItsProcess)
+TEST_F(ClientServerInstanceTest, CreatesASessionOwnedByItsProcess)
 {
     EXPECT_EQ(create(42), answeredOnce(succeeded));
     ASSERT_NE(player.session(42), nullptr);
@@ -166,7 +166,7 @@ TEST_F(ClientTest, CreatesASessionOwnedByItsProcess)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientCreate, sessionCreated));
 }
 
-TEST_F(ClientTest, ReplacesASessionOfTheSameIDWithoutStoppingOrReportingIt)
+TEST_F(ClientServerInstanceTest, ReplacesASessionOfTheSameIDWithoutStoppingOrReportingIt)
 {
     platform.analytics.use("*");
     create(42);
@@ -187,7 +187,7 @@ TEST_F(ClientTest, ReplacesASessionOfTheSameIDWithoutStoppingOrReportingIt)
     EXPECT_THAT(platform.analytics.sent(), IsEmpty());
 }
 
-TEST_F(ClientTest, NeverAnswersTheStartOfASessionThatWasReplaced)
+TEST_F(ClientServerInstanceTest, NeverAnswersTheStartOfASessionThatWasReplaced)
 {
     create(42);
     const auto started = player.submit(StartReportingSessionForID, {42});
@@ -197,7 +197,7 @@ TEST_F(ClientTest, NeverAnswersTheStartOfASessionThatWasReplaced)
     EXPECT_EQ(player.connection().unansweredCalls(), 0U) << "and nothing waits for it";
 }
 
-TEST_F(ClientTest, CreatesNoMoreSessionsThanItMayHave)
+TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanItMayHave)
 {
     constexpr auto most = static_cast<std::int64_t>(KestoReportingClientServerInstance::mostSessions);
     for (std::int64_t reporterID = 1; reporterID <= most; ++reporterID)
@@ -231,7 +231,7 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanItMayHave)
 }
 
 // All their IDs are answered in one frame.
-TEST_F(ClientTest, CreatesNoMoreSessionsThanAllClientsMayHaveTogether)
+TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanAllClientsMayHaveTogether)
 {
     constexpr std::size_t longestID = 9; // bytes of CBOR
     constexpr std::size_t restOfAnAnswer = 32;
@@ -265,7 +265,7 @@ TEST_F(ClientTest, CreatesNoMoreSessionsThanAllClientsMayHaveTogether)
 
 // --- set service type
 
-TEST_F(ClientTest, SetsAServiceType)
+TEST_F(ClientServerInstanceTest, SetsAServiceType)
 {
     create(42);
     harness.forget();
@@ -278,7 +278,7 @@ TEST_F(ClientTest, SetsAServiceType)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
-TEST_F(ClientTest, SetsNoServiceTypeOfASessionThatItDoesNotHave)
+TEST_F(ClientServerInstanceTest, SetsNoServiceTypeOfASessionThatItDoesNotHave)
 {
     recorder.call(CreateReportingSession, 43);
     harness.forget();
@@ -287,7 +287,7 @@ TEST_F(ClientTest, SetsNoServiceTypeOfASessionThatItDoesNotHave)
     EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "setting service type 4 for reporter 43")));
 }
 
-TEST_F(ClientTest, SetsNoServiceTypeOfSessionZero)
+TEST_F(ClientServerInstanceTest, SetsNoServiceTypeOfSessionZero)
 {
     create(0);
     harness.forget();
@@ -298,7 +298,7 @@ TEST_F(ClientTest, SetsNoServiceTypeOfSessionZero)
 
 // --- get service type
 
-TEST_F(ClientTest, TellsTheServiceTypeOfItsOwnSession)
+TEST_F(ClientServerInstanceTest, TellsTheServiceTypeOfItsOwnSession)
 {
     create(42);
     player.call(SetServiceType, 4, 42);
@@ -310,7 +310,7 @@ TEST_F(ClientTest, TellsTheServiceTypeOfItsOwnSession)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
-TEST_F(ClientTest, TellsTheServiceTypeOfAnotherClientsSession)
+TEST_F(ClientServerInstanceTest, TellsTheServiceTypeOfAnotherClientsSession)
 {
     create(42);
     player.call(SetServiceType, 4, 42);
@@ -322,7 +322,7 @@ TEST_F(ClientTest, TellsTheServiceTypeOfAnotherClientsSession)
                             IsLine(Default, "kerc", "returning service type 4 for reporter  42")));
 }
 
-TEST_F(ClientTest, PrefersItsOwnSessionToThatOfAClientThatCameBefore)
+TEST_F(ClientServerInstanceTest, PrefersItsOwnSessionToThatOfAClientThatCameBefore)
 {
     create(42);
     player.call(SetServiceType, 4, 42);
@@ -331,7 +331,7 @@ TEST_F(ClientTest, PrefersItsOwnSessionToThatOfAClientThatCameBefore)
     EXPECT_EQ(recorder.call(GetServiceNameForReporterID, 42), answeredOnce({null, 7}));
 }
 
-TEST_F(ClientTest, TellsAnUnknownServiceTypeOfASessionThatNobodyHas)
+TEST_F(ClientServerInstanceTest, TellsAnUnknownServiceTypeOfASessionThatNobodyHas)
 {
     EXPECT_EQ(player.call(GetServiceNameForReporterID, 42), answeredOnce({null, 65535}));
     EXPECT_THAT(lines(),
@@ -340,7 +340,7 @@ TEST_F(ClientTest, TellsAnUnknownServiceTypeOfASessionThatNobodyHas)
                             IsLine(Default, "kerc", "returning service type 65535 for reporter  42")));
 }
 
-TEST_F(ClientTest, AnswersTheServiceTypeOfSessionZeroTwice)
+TEST_F(ClientServerInstanceTest, AnswersTheServiceTypeOfSessionZeroTwice)
 {
     EXPECT_EQ(player.call(GetServiceNameForReporterID, 0), (Answers{{null, 65535}, {null, 65535}}));
     EXPECT_THAT(lines(),
@@ -348,7 +348,7 @@ TEST_F(ClientTest, AnswersTheServiceTypeOfSessionZeroTwice)
                             IsLine(Default, "kerc", "returning service type 65535 for reporter  0")));
 }
 
-TEST_F(ClientTest, AnswersTheServiceTypeOfItsOwnSessionZeroTheSecondTime)
+TEST_F(ClientServerInstanceTest, AnswersTheServiceTypeOfItsOwnSessionZeroTheSecondTime)
 {
     create(0);
     EXPECT_EQ(player.call(GetServiceNameForReporterID, 0), (Answers{{null, 65535}, {null, 0}}));
@@ -358,7 +358,7 @@ TEST_F(ClientTest, AnswersTheServiceTypeOfItsOwnSessionZeroTheSecondTime)
 
 // --- set configuration
 
-TEST_F(ClientTest, MergesAConfiguration)
+TEST_F(ClientServerInstanceTest, MergesAConfiguration)
 {
     create(42);
     harness.forget();
@@ -371,21 +371,21 @@ TEST_F(ClientTest, MergesAConfiguration)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
-TEST_F(ClientTest, ConfiguresSessionZero)
+TEST_F(ClientServerInstanceTest, ConfiguresSessionZero)
 {
     create(0);
     EXPECT_EQ(player.call(SetConfiguration, Dictionary{{"a", 1}}, 0), answeredOnce(succeeded));
     EXPECT_EQ(player.session(0)->configuration(), (Dictionary{{"a", 1}}));
 }
 
-TEST_F(ClientTest, ConfiguresNoSessionThatItDoesNotHave)
+TEST_F(ClientServerInstanceTest, ConfiguresNoSessionThatItDoesNotHave)
 {
     recorder.call(CreateReportingSession, 43);
     EXPECT_EQ(player.call(SetConfiguration, Dictionary{{"a", 1}}, 43), answeredOnce(succeeded));
     EXPECT_EQ(recorder.session(43)->configuration(), Dictionary());
 }
 
-TEST_F(ClientTest, CannotSendTheTraceTypeConstant)
+TEST_F(ClientServerInstanceTest, CannotSendTheTraceTypeConstant)
 {
     create(42);
     player.call(SetConfiguration, Dictionary{{"KestoReportingTraceType", KestoReportingTraceTypeKtrace}}, 42);
@@ -396,7 +396,7 @@ TEST_F(ClientTest, CannotSendTheTraceTypeConstant)
 
 // --- start
 
-TEST_F(ClientTest, StartsASessionAndHoldsTheAnswer)
+TEST_F(ClientServerInstanceTest, StartsASessionAndHoldsTheAnswer)
 {
     create(42);
     harness.forget();
@@ -415,7 +415,7 @@ TEST_F(ClientTest, StartsASessionAndHoldsTheAnswer)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStart, sessionStarted));
 }
 
-TEST_F(ClientTest, AnswersAStartOfASessionThatIsStartedAtOnce)
+TEST_F(ClientServerInstanceTest, AnswersAStartOfASessionThatIsStartedAtOnce)
 {
     create(42);
     const auto first = player.submit(StartReportingSessionForID, {42});
@@ -431,7 +431,7 @@ TEST_F(ClientTest, AnswersAStartOfASessionThatIsStartedAtOnce)
     EXPECT_EQ(player.answersTo(first), answeredOnce(succeeded)) << "the stored callback was not replaced";
 }
 
-TEST_F(ClientTest, StartsNeitherSessionZeroNorOneThatItDoesNotHave)
+TEST_F(ClientServerInstanceTest, StartsNeitherSessionZeroNorOneThatItDoesNotHave)
 {
     create(0);
     recorder.call(CreateReportingSession, 43);
@@ -447,7 +447,7 @@ TEST_F(ClientTest, StartsNeitherSessionZeroNorOneThatItDoesNotHave)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStart, clientStart, clientStart));
 }
 
-TEST_F(ClientTest, AnswersTheFirstOfTwoStartsAtTheStopBetweenThem)
+TEST_F(ClientServerInstanceTest, AnswersTheFirstOfTwoStartsAtTheStopBetweenThem)
 {
     create(42);
     const auto first = player.submit(StartReportingSessionForID, {42});
@@ -464,7 +464,7 @@ TEST_F(ClientTest, AnswersTheFirstOfTwoStartsAtTheStopBetweenThem)
     EXPECT_TRUE(player.session(42)->started());
 }
 
-TEST_F(ClientTest, AnswersACallbackThatTheSessionStillHoldsBeforeItStoresTheNext)
+TEST_F(ClientServerInstanceTest, AnswersACallbackThatTheSessionStillHoldsBeforeItStoresTheNext)
 {
     create(42);
     int answered = 0;
@@ -479,7 +479,7 @@ TEST_F(ClientTest, AnswersACallbackThatTheSessionStillHoldsBeforeItStoresTheNext
     EXPECT_EQ(answered, 1);
 }
 
-TEST_F(ClientTest, TellsAStartedSessionTheFeatureState)
+TEST_F(ClientServerInstanceTest, TellsAStartedSessionTheFeatureState)
 {
     platform.preferences.set("com.quarn.kesto", "device_name", "Speaker");
     create(42);
@@ -493,14 +493,14 @@ TEST_F(ClientTest, TellsAStartedSessionTheFeatureState)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStart, sessionStarted, sessionMessageAccepted));
 }
 
-TEST_F(ClientTest, TellsAStartedSessionNothingWhenNoFeatureIsKnown)
+TEST_F(ClientServerInstanceTest, TellsAStartedSessionNothingWhenNoFeatureIsKnown)
 {
     create(42);
     start(42);
     EXPECT_THAT(*player.session(42)->nestedAggregatedPayloadData(), IsEmpty());
 }
 
-class TracedStartTest : public ClientTest {
+class TracedStartTest : public ClientServerInstanceTest {
 protected:
     void makeTestSession(AudioServiceType serviceType)
     {
@@ -570,7 +570,7 @@ TEST_F(TracedStartTest, IsHeldOnASystemThatCannotTrace)
 
 // --- stop
 
-TEST_F(ClientTest, StopsASessionAndAnswersItsStart)
+TEST_F(ClientServerInstanceTest, StopsASessionAndAnswersItsStart)
 {
     create(42);
     const auto started = player.submit(StartReportingSessionForID, {42});
@@ -592,7 +592,7 @@ TEST_F(ClientTest, StopsASessionAndAnswersItsStart)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStop, sessionStopping));
 }
 
-TEST_F(ClientTest, LetsGoOfTheDriversSnapshotBeforeItStopsASession)
+TEST_F(ClientServerInstanceTest, LetsGoOfTheDriversSnapshotBeforeItStopsASession)
 {
     create(42);
     start(42);
@@ -607,7 +607,7 @@ TEST_F(ClientTest, LetsGoOfTheDriversSnapshotBeforeItStopsASession)
     EXPECT_THAT(snapShots, ElementsAre(false, false));
 }
 
-TEST_F(ClientTest, AnswersTheStopOfASessionThatIsNotStarted)
+TEST_F(ClientServerInstanceTest, AnswersTheStopOfASessionThatIsNotStarted)
 {
     create(42);
     harness.forget();
@@ -618,7 +618,7 @@ TEST_F(ClientTest, AnswersTheStopOfASessionThatIsNotStarted)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientStop));
 }
 
-TEST_F(ClientTest, StopsNoSessionThatItDoesNotHave)
+TEST_F(ClientServerInstanceTest, StopsNoSessionThatItDoesNotHave)
 {
     recorder.call(CreateReportingSession, 43);
     recorder.call(StartReportingSessionForID, 43);
@@ -630,7 +630,7 @@ TEST_F(ClientTest, StopsNoSessionThatItDoesNotHave)
         ElementsAre(IsLine(Debug, "kerc", "stopping session for reporter 43"), IsLine(Default, "kerc", "stopping 43")));
 }
 
-TEST_F(ClientTest, AnswersTheStopOfSessionZeroWithoutAnotherWord)
+TEST_F(ClientServerInstanceTest, AnswersTheStopOfSessionZeroWithoutAnotherWord)
 {
     create(0);
     support::onServerQueue(harness.platform.workQueues, [&] { player.session(0)->start(); });
@@ -643,7 +643,7 @@ TEST_F(ClientTest, AnswersTheStopOfSessionZeroWithoutAnotherWord)
 
 // --- destroy
 
-TEST_F(ClientTest, DestroysAStartedSessionWithoutAnsweringItsStart)
+TEST_F(ClientServerInstanceTest, DestroysAStartedSessionWithoutAnsweringItsStart)
 {
     create(42);
     const auto started = player.submit(StartReportingSessionForID, {42});
@@ -661,7 +661,7 @@ TEST_F(ClientTest, DestroysAStartedSessionWithoutAnsweringItsStart)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientDestroy, sessionStopping, sessionDestroyed));
 }
 
-TEST_F(ClientTest, DestroysASessionThatIsNotStartedWithoutStoppingIt)
+TEST_F(ClientServerInstanceTest, DestroysASessionThatIsNotStartedWithoutStoppingIt)
 {
     create(42);
     harness.forget();
@@ -674,7 +674,7 @@ TEST_F(ClientTest, DestroysASessionThatIsNotStartedWithoutStoppingIt)
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(clientDestroy, sessionDestroyed));
 }
 
-TEST_F(ClientTest, DestroysNoSessionThatItDoesNotHave)
+TEST_F(ClientServerInstanceTest, DestroysNoSessionThatItDoesNotHave)
 {
     recorder.call(CreateReportingSession, 43);
     harness.forget();
@@ -685,7 +685,7 @@ TEST_F(ClientTest, DestroysNoSessionThatItDoesNotHave)
                             IsLine(Default, "kerc", "destroying 43")));
 }
 
-TEST_F(ClientTest, DestroysSessionZeroNeither)
+TEST_F(ClientServerInstanceTest, DestroysSessionZeroNeither)
 {
     create(0);
     harness.forget();
@@ -697,7 +697,7 @@ TEST_F(ClientTest, DestroysSessionZeroNeither)
 
 // --- validate and list
 
-TEST_F(ClientTest, ValidatesASessionOfAnyClient)
+TEST_F(ClientServerInstanceTest, ValidatesASessionOfAnyClient)
 {
     create(42);
     player.call(SetServiceType, 4, 42);
@@ -716,20 +716,20 @@ TEST_F(ClientTest, ValidatesASessionOfAnyClient)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
-TEST_F(ClientTest, ValidatesNoSessionThatNobodyHas)
+TEST_F(ClientServerInstanceTest, ValidatesNoSessionThatNobodyHas)
 {
     const Array invalid{null, Dictionary{{"reporterID", 0}, {"serviceType", 65535}}};
     EXPECT_EQ(player.call(ValidReporterID, 42), answeredOnce(invalid));
     EXPECT_EQ(player.call(ValidReporterID, 0), answeredOnce(invalid));
 }
 
-TEST_F(ClientTest, ValidatesItsOwnSessionZero)
+TEST_F(ClientServerInstanceTest, ValidatesItsOwnSessionZero)
 {
     create(0);
     EXPECT_EQ(player.call(ValidReporterID, 0), answeredOnce({null, Dictionary{{"reporterID", 0}, {"serviceType", 0}}}));
 }
 
-TEST_F(ClientTest, ListsTheReportersOfAllClientsInOrder)
+TEST_F(ClientServerInstanceTest, ListsTheReportersOfAllClientsInOrder)
 {
     EXPECT_EQ(player.call(GetAllReporters), answeredOnce({null, Array{}}));
     recorder.call(CreateReportingSession, 5);
@@ -744,7 +744,7 @@ TEST_F(ClientTest, ListsTheReportersOfAllClientsInOrder)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
-TEST_F(ClientTest, ListsNothingForWhoIsGone)
+TEST_F(ClientServerInstanceTest, ListsNothingForWhoIsGone)
 {
     create(42);
     const auto call = player.submit(GetAllReporters, {});
@@ -757,7 +757,7 @@ TEST_F(ClientTest, ListsNothingForWhoIsGone)
 
 // --- what the log shows of many sessions
 
-TEST_F(ClientTest, DescribesNoMoreSessionsThanALogLineShows)
+TEST_F(ClientServerInstanceTest, DescribesNoMoreSessionsThanALogLineShows)
 {
     constexpr std::int64_t sessions = 2000;
     constexpr std::size_t longestLine = 64 * 1024;
@@ -780,7 +780,7 @@ TEST_F(ClientTest, DescribesNoMoreSessionsThanALogLineShows)
 
 // --- kill
 
-class ClientDeathTest : public ClientTest {
+class ClientDeathTest : public ClientServerInstanceTest {
 protected:
     void killAloud()
     {
@@ -807,7 +807,7 @@ TEST_F(ClientDeathTest, EndsTheProcessAtOnceWithoutWhatIsLeftForItsExit)
 
 // --- connection loss
 
-TEST_F(ClientTest, StopsItsStartedSessionsInOrderAndLeavesWhenTheConnectionIsLost)
+TEST_F(ClientServerInstanceTest, StopsItsStartedSessionsInOrderAndLeavesWhenTheConnectionIsLost)
 {
     for (const std::int64_t reporterID : {3, 1, 2})
         create(reporterID);
@@ -830,7 +830,7 @@ TEST_F(ClientTest, StopsItsStartedSessionsInOrderAndLeavesWhenTheConnectionIsLos
                 ElementsAre(sessionStopping, sessionStopping, sessionDestroyed, sessionDestroyed, sessionDestroyed));
 }
 
-TEST_F(ClientTest, SaysThatItIsRemovedOnceItIs)
+TEST_F(ClientServerInstanceTest, SaysThatItIsRemovedOnceItIs)
 {
     std::vector<std::size_t> clients;
     platform.log.setObserver([&](const LogLine& line) {
@@ -843,7 +843,7 @@ TEST_F(ClientTest, SaysThatItIsRemovedOnceItIs)
     EXPECT_THAT(clients, ElementsAre(1));
 }
 
-TEST_F(ClientTest, DoesNothingWhenItsConnectionIsLostAgain)
+TEST_F(ClientServerInstanceTest, DoesNothingWhenItsConnectionIsLostAgain)
 {
     player.object()->handleConnectionError();
     platform.workQueues.runAll();
@@ -854,7 +854,7 @@ TEST_F(ClientTest, DoesNothingWhenItsConnectionIsLostAgain)
     EXPECT_THAT(harness.service->getAllClients(), ElementsAre(recorder.object()));
 }
 
-TEST_F(ClientTest, NeverAnswersAStartWhoseConnectionWasLost)
+TEST_F(ClientServerInstanceTest, NeverAnswersAStartWhoseConnectionWasLost)
 {
     create(42);
     const auto started = player.submit(StartReportingSessionForID, {42});
@@ -865,7 +865,7 @@ TEST_F(ClientTest, NeverAnswersAStartWhoseConnectionWasLost)
     EXPECT_EQ(player.connection().unansweredCalls(), 0U);
 }
 
-TEST_F(ClientTest, IsNotFoundAnyMoreOnceItIsGone)
+TEST_F(ClientServerInstanceTest, IsNotFoundAnyMoreOnceItIsGone)
 {
     create(42);
     player.close();
@@ -873,7 +873,7 @@ TEST_F(ClientTest, IsNotFoundAnyMoreOnceItIsGone)
     EXPECT_EQ(player.object(), nullptr);
 }
 
-TEST_F(ClientTest, CarriesOutTheCallsThatCameBeforeItsEnd)
+TEST_F(ClientServerInstanceTest, CarriesOutTheCallsThatCameBeforeItsEnd)
 {
     player.submit(CreateReportingSession, {42});
     player.submit(StartReportingSessionForID, {42});
@@ -887,7 +887,7 @@ TEST_F(ClientTest, CarriesOutTheCallsThatCameBeforeItsEnd)
 
 // The service object is gone. One client has the session 41, which is created, and 42, which is started; another client
 // has 43. Every operation is answered, and does what it can do without the service object.
-class OrphanTest : public ClientTest {
+class OrphanTest : public ClientServerInstanceTest {
 protected:
     OrphanTest()
     {

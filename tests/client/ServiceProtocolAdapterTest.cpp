@@ -156,19 +156,19 @@ TEST_F(AdapterTest, RefusesMethodsThatAreNoNumbersWithoutRepeatingThem)
         EXPECT_EQ(refusal({1, method, 42}), "a call's method is an integer from 1 to 11");
 }
 
-struct Operation {
+struct CalledOperation {
     int number;
     std::string name;
     std::vector<std::string> argumentNames;
     std::vector<Value> arguments; // good ones
 };
 
-void PrintTo(const Operation& operation, std::ostream* out)
+void PrintTo(const CalledOperation& operation, std::ostream* out)
 {
     *out << operation.name;
 }
 
-const std::vector<Operation> operations{
+const std::vector<CalledOperation> operations{
     {1, "createReportingSession", {"reporter ID"}, {42}},
     {2, "setServiceType", {"service type", "reporter ID"}, {4, 42}},
     {3, "getServiceNameForReporterID", {"reporter ID"}, {42}},
@@ -211,7 +211,7 @@ Expectation expectationOf(const std::string& argument)
     return {"a map", {null, Value(42), Value("{}"), Value(Array{}), Value(true), Value(foundation::Data{})}};
 }
 
-class OperationTest : public AdapterTest, public testing::WithParamInterface<Operation> {
+class OperationTest : public AdapterTest, public testing::WithParamInterface<CalledOperation> {
 protected:
     std::optional<std::string> refusalOf(const std::vector<Value>& arguments)
     {

@@ -138,10 +138,10 @@ std::size_t Kestod::countInLog(std::string_view text) const
     return count;
 }
 
-std::expected<std::vector<StoredEvent>, std::string> Kestod::readEvents(std::string_view pattern) const
+std::expected<std::vector<StoreRow>, std::string> Kestod::readEvents(std::string_view pattern) const
 {
     const fs::path path = directory() / "state" / "analytics.sqlite3";
-    std::vector<StoredEvent> events;
+    std::vector<StoreRow> events;
     sqlite3* database = nullptr;
     sqlite3_stmt* query = nullptr;
     int status = sqlite3_open_v2(path.c_str(), &database, SQLITE_OPEN_READONLY, nullptr);
@@ -166,7 +166,7 @@ std::expected<std::vector<StoredEvent>, std::string> Kestod::readEvents(std::str
     return events;
 }
 
-std::vector<StoredEvent> Kestod::events(std::string_view pattern) const
+std::vector<StoreRow> Kestod::events(std::string_view pattern) const
 {
     auto events = readEvents(pattern);
     if (!events)
@@ -174,10 +174,9 @@ std::vector<StoredEvent> Kestod::events(std::string_view pattern) const
     return *std::move(events);
 }
 
-std::vector<StoredEvent> Kestod::waitForEvents(std::string_view pattern) const
+std::vector<StoreRow> Kestod::waitForEvents(std::string_view pattern) const
 {
-    waitUntil(
-        [&] { return !readEvents(pattern).value_or(std::vector<StoredEvent>()).empty(); }); // it may not be made yet
+    waitUntil([&] { return !readEvents(pattern).value_or(std::vector<StoreRow>()).empty(); }); // it may not be made yet
     return events(pattern);
 }
 

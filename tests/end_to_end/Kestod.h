@@ -33,7 +33,7 @@ template <typename Condition> bool waitUntil(Condition condition)
 }
 
 // One row of the store.
-struct StoredEvent {
+struct StoreRow {
     std::string name;
     std::string payload; // JSON
 };
@@ -81,12 +81,12 @@ public:
     [[nodiscard]] std::size_t countInLog(std::string_view text) const;
 
     // The stored events of names that match the pattern (GLOB), in order. Throws when the store cannot be read.
-    [[nodiscard]] std::vector<StoredEvent> events(std::string_view pattern = "*") const;
+    [[nodiscard]] std::vector<StoreRow> events(std::string_view pattern = "*") const;
     // Waits for such an event.
-    [[nodiscard]] std::vector<StoredEvent> waitForEvents(std::string_view pattern) const;
+    [[nodiscard]] std::vector<StoreRow> waitForEvents(std::string_view pattern) const;
 
 private:
-    [[nodiscard]] std::expected<std::vector<StoredEvent>, std::string> readEvents(std::string_view pattern) const;
+    [[nodiscard]] std::expected<std::vector<StoreRow>, std::string> readEvents(std::string_view pattern) const;
 
     const support::TemporaryDirectory directory_;
     Environment environment_;

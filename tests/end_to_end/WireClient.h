@@ -14,7 +14,7 @@
 namespace end_to_end {
 
 // The operations by their numbers on the wire.
-enum Method : std::uint8_t {
+enum WireMethod : std::uint8_t {
     Create = 1,
     SetServiceType,
     GetServiceName,
@@ -35,14 +35,14 @@ public:
     explicit WireClient(const std::filesystem::path& socketPath);
 
     // Sends a call and returns its number.
-    template <typename... Arguments> std::uint64_t call(Method method, Arguments... arguments)
+    template <typename... Arguments> std::uint64_t call(WireMethod method, Arguments... arguments)
     {
         const std::uint64_t number = nextCall_++;
         sendFrame(foundation::Array{number, static_cast<int>(method), foundation::Value(arguments)...});
         return number;
     }
     // Sends a call and returns the reply that must come next, which must be the call's.
-    template <typename... Arguments> foundation::Array ask(Method method, Arguments... arguments)
+    template <typename... Arguments> foundation::Array ask(WireMethod method, Arguments... arguments)
     {
         return replyTo(call(method, arguments...));
     }

@@ -20,9 +20,9 @@ constexpr std::int32_t pid = 17;
 constexpr std::string_view uptimeEvent = "com.quarn.kesto.kestoreportingclientuptime";
 constexpr double startDate = 2'000'000'000.25;
 
-class ConnectionTest : public testing::Test {
+class ClientConnectionTest : public testing::Test {
 protected:
-    ConnectionTest()
+    ClientConnectionTest()
     {
         platform.processTable.add(pid, "player");
         platform.analytics.use("com.quarn.*"); // as a device does unless its owner says otherwise
@@ -54,7 +54,7 @@ protected:
 
 // --- acceptance
 
-TEST_F(ConnectionTest, IsAcceptedAndResumed)
+TEST_F(ClientConnectionTest, IsAcceptedAndResumed)
 {
     const auto connection = accept();
     EXPECT_TRUE(connection->isResumed());
@@ -63,7 +63,7 @@ TEST_F(ConnectionTest, IsAcceptedAndResumed)
                             IsLine(Default, "kerc", "new client with pid 17")));
 }
 
-TEST_F(ConnectionTest, IsRegisteredOnTheServerQueue)
+TEST_F(ClientConnectionTest, IsRegisteredOnTheServerQueue)
 {
     const auto connection = accept();
     EXPECT_THAT(clients(), IsEmpty());
@@ -75,7 +75,7 @@ TEST_F(ConnectionTest, IsRegisteredOnTheServerQueue)
     EXPECT_THAT(platform.processTable.forgotten(), ElementsAre(pid)) << "the name is that of now, since it is kept";
 }
 
-TEST_F(ConnectionTest, IsRegisteredBeforeItsFirstCallIsServed)
+TEST_F(ClientConnectionTest, IsRegisteredBeforeItsFirstCallIsServed)
 {
     const auto connection = accept();
     EXPECT_TRUE(connection->call({1, 1, 42}));
@@ -83,7 +83,7 @@ TEST_F(ConnectionTest, IsRegisteredBeforeItsFirstCallIsServed)
     EXPECT_NE(harness.find(42), nullptr);
 }
 
-TEST_F(ConnectionTest, HasAClientOfItsOwn)
+TEST_F(ClientConnectionTest, HasAClientOfItsOwn)
 {
     const auto first = connect();
     const auto second = connect();
@@ -95,7 +95,7 @@ TEST_F(ConnectionTest, HasAClientOfItsOwn)
     EXPECT_EQ(clients()[1]->clientReportingSessionMap().find(42), nullptr);
 }
 
-TEST_F(ConnectionTest, GetsItsClientWhileNoSessionIsLookedUp)
+TEST_F(ClientConnectionTest, GetsItsClientWhileNoSessionIsLookedUp)
 {
     std::optional<WatchedThread> looker;
     bool waits = false;
@@ -114,7 +114,7 @@ TEST_F(ConnectionTest, GetsItsClientWhileNoSessionIsLookedUp)
     EXPECT_THAT(platform.log.lines("kers"), Contains(IsLine(Error, "kers", "failed to find reporting session 42")));
 }
 
-TEST_F(ConnectionTest, EndsWhenACallBreaksTheProtocolAndNoOtherDoes)
+TEST_F(ClientConnectionTest, EndsWhenACallBreaksTheProtocolAndNoOtherDoes)
 {
     const auto hostile = connect();
     const auto other = connect();
@@ -130,7 +130,7 @@ TEST_F(ConnectionTest, EndsWhenACallBreaksTheProtocolAndNoOtherDoes)
 
 // --- invalidation
 
-TEST_F(ConnectionTest, ThatIsClosedLeavesTheRegistryAndTellsItsTime)
+TEST_F(ClientConnectionTest, ThatIsClosedLeavesTheRegistryAndTellsItsTime)
 {
     const auto connection = connect();
     platform.clock.advance(12.5);
@@ -147,7 +147,7 @@ TEST_F(ConnectionTest, ThatIsClosedLeavesTheRegistryAndTellsItsTime)
     EXPECT_EQ(uptimes()[0].kind(), Number::Kind::Float64);
 }
 
-TEST_F(ConnectionTest, ThatIsClosedHasItsClientLeaveBeforeAnythingElseIsDone)
+TEST_F(ClientConnectionTest, ThatIsClosedHasItsClientLeaveBeforeAnythingElseIsDone)
 {
     const auto connection = connect();
     clients()[0]->setClientStartDate(std::nullopt);
@@ -158,7 +158,7 @@ TEST_F(ConnectionTest, ThatIsClosedHasItsClientLeaveBeforeAnythingElseIsDone)
     EXPECT_THAT(submitted, ElementsAre(1, 1)) << "before each of the two lines";
 }
 
-TEST_F(ConnectionTest, OfNoTimeIsStillADouble)
+TEST_F(ClientConnectionTest, OfNoTimeIsStillADouble)
 {
     const auto connection = connect();
     connection->close();
@@ -170,14 +170,14 @@ TEST_F(ConnectionTest, OfNoTimeIsStillADouble)
         << "it began no later than now";
 }
 
-TEST_F(ConnectionTest, TellsItsTimeWithoutBuildingThePayload)
+TEST_F(ClientConnectionTest, TellsItsTimeWithoutBuildingThePayload)
 {
     connect()->close();
     EXPECT_THAT(platform.analytics.sent(), ElementsAre(uptimeEvent));
     EXPECT_EQ(platform.analytics.timesBuilt(), 0);
 }
 
-TEST_F(ConnectionTest, ThatBeganLaterThanNowSaysSoInItsOwnWords)
+TEST_F(ClientConnectionTest, ThatBeganLaterThanNowSaysSoInItsOwnWords)
 {
     const auto connection = connect();
     platform.clock.set(startDate - 99.75);
@@ -189,7 +189,7 @@ TEST_F(ConnectionTest, ThatBeganLaterThanNowSaysSoInItsOwnWords)
     EXPECT_THAT(uptimes(), ElementsAre(Number(99.75))) << "the length of the interval, whichever way it runs";
 }
 
-TEST_F(ConnectionTest, OfUnknownBeginningHasAnUptimeOfMinusOneAsAnInteger)
+TEST_F(ClientConnectionTest, OfUnknownBeginningHasAnUptimeOfMinusOneAsAnInteger)
 {
     const auto connection = connect();
     clients()[0]->setClientStartDate(std::nullopt);
@@ -202,7 +202,7 @@ TEST_F(ConnectionTest, OfUnknownBeginningHasAnUptimeOfMinusOneAsAnInteger)
     EXPECT_EQ(uptimes()[0].kind(), Number::Kind::Signed64);
 }
 
-TEST_F(ConnectionTest, OfAProcessWithoutANameSendsNoEvent)
+TEST_F(ClientConnectionTest, OfAProcessWithoutANameSendsNoEvent)
 {
     platform.processTable.remove(pid);
     const auto connection = connect();
@@ -216,7 +216,7 @@ TEST_F(ConnectionTest, OfAProcessWithoutANameSendsNoEvent)
     EXPECT_THAT(platform.analytics.sent(), IsEmpty());
 }
 
-TEST_F(ConnectionTest, ThatEndsBeforeItIsRegisteredIsRegisteredAndRemoved)
+TEST_F(ClientConnectionTest, ThatEndsBeforeItIsRegisteredIsRegisteredAndRemoved)
 {
     const auto connection = accept();
     harness.forget();
@@ -235,7 +235,7 @@ TEST_F(ConnectionTest, ThatEndsBeforeItIsRegisteredIsRegisteredAndRemoved)
                             IsLine(Default, "kerc", "dealloc 17 from the server client list")));
 }
 
-TEST_F(ConnectionTest, WhoseClientIsFreedAlreadyKnowsNothingOfIt)
+TEST_F(ClientConnectionTest, WhoseClientIsFreedAlreadyKnowsNothingOfIt)
 {
     const auto connection = connect();
     connection->interrupt();
@@ -251,7 +251,7 @@ TEST_F(ConnectionTest, WhoseClientIsFreedAlreadyKnowsNothingOfIt)
     EXPECT_EQ(platform.workQueues.pending(), 0U);
 }
 
-TEST_F(ConnectionTest, IsReleasedWhenItIsOver)
+TEST_F(ClientConnectionTest, IsReleasedWhenItIsOver)
 {
     auto connection = connect();
     connection->call({1, 1, 42});
@@ -266,7 +266,7 @@ TEST_F(ConnectionTest, IsReleasedWhenItIsOver)
 
 // --- interruption
 
-TEST_F(ConnectionTest, ThatBreaksIsRemovedOnceAndItsSessionsAreStoppedOnce)
+TEST_F(ClientConnectionTest, ThatBreaksIsRemovedOnceAndItsSessionsAreStoppedOnce)
 {
     const auto connection = connect();
     connection->call({1, 1, 42});
@@ -291,7 +291,7 @@ TEST_F(ConnectionTest, ThatBreaksIsRemovedOnceAndItsSessionsAreStoppedOnce)
     EXPECT_THAT(uptimes(), SizeIs(1));
 }
 
-TEST_F(ConnectionTest, ThatBreaksIsSaidToBeforeItsClientHearsOfIt)
+TEST_F(ClientConnectionTest, ThatBreaksIsSaidToBeforeItsClientHearsOfIt)
 {
     const auto connection = connect();
     std::vector<std::size_t> submitted;
@@ -305,7 +305,7 @@ TEST_F(ConnectionTest, ThatBreaksIsSaidToBeforeItsClientHearsOfIt)
     EXPECT_EQ(platform.workQueues.pending(), 1U);
 }
 
-TEST_F(ConnectionTest, ThatIsInvalidatedLongAfterItBrokeFindsItsClientGone)
+TEST_F(ClientConnectionTest, ThatIsInvalidatedLongAfterItBrokeFindsItsClientGone)
 {
     const auto connection = connect();
     connection->interrupt();
@@ -322,7 +322,7 @@ TEST_F(ConnectionTest, ThatIsInvalidatedLongAfterItBrokeFindsItsClientGone)
     EXPECT_THAT(uptimes(), ElementsAre(Number(5.0)));
 }
 
-TEST_F(ConnectionTest, OfOneProcessMayBeOneOfMany)
+TEST_F(ClientConnectionTest, OfOneProcessMayBeOneOfMany)
 {
     const auto first = connect();
     const auto second = connect();

@@ -66,15 +66,15 @@ foundation::Value timeValue(const Time& time, double now)
     }
 }
 
-struct Message {
+struct TimedPayload {
     Time time;
     foundation::Dictionary::Entries entries;
 };
 
-rc::Gen<Message> message()
+rc::Gen<TimedPayload> message()
 {
     return rc::gen::exec([] {
-        Message message{*time(), {}};
+        TimedPayload message{*time(), {}};
         const auto maybe = [&](int percent, const char* key, std::vector<foundation::Value> usual) {
             if (*rc::gen::inRange(0, 100) < percent)
                 message.entries.push_back({key, *valueAmong(std::move(usual))});
@@ -95,18 +95,19 @@ rc::Gen<Message> message()
 
 rc::Gen<Messages> payloads()
 {
-    return rc::gen::map(rc::gen::container<std::vector<Message>>(message()), [](const std::vector<Message>& messages) {
-        Messages payloads;
-        double now = 10;
-        for (const Message& message : messages) {
-            now += message.time.later;
-            auto entries = message.entries;
-            if (message.time.form != Time::Form::None)
-                entries.push_back({"kestoreporting_timestamp", timeValue(message.time, now)});
-            payloads.emplace_back(std::move(entries));
-        }
-        return payloads;
-    });
+    return rc::gen::map(rc::gen::container<std::vector<TimedPayload>>(message()),
+                        [](const std::vector<TimedPayload>& messages) {
+                            Messages payloads;
+                            double now = 10;
+                            for (const TimedPayload& message : messages) {
+                                now += message.time.later;
+                                auto entries = message.entries;
+                                if (message.time.form != Time::Form::None)
+                                    entries.push_back({"kestoreporting_timestamp", timeValue(message.time, now)});
+                                payloads.emplace_back(std::move(entries));
+                            }
+                            return payloads;
+                        });
 }
 
 } // namespace

@@ -36,7 +36,7 @@ Dictionary stopAt(const Value& time)
     return at(time, {{"session_output_running", false}});
 }
 
-class VolumeMessages : public testing::Test {
+class SessionVolumeEvents : public testing::Test {
 protected:
     static Messages create(const Messages& payloads, const std::optional<Value>& process = Value("player"),
                            double minimumPlaytime = 0.5)
@@ -64,7 +64,7 @@ protected:
 
 // --- what an event says
 
-TEST_F(VolumeMessages, SayWhatWasPlayedHowInThirteenEntriesInOrder)
+TEST_F(SessionVolumeEvents, SayWhatWasPlayedHowInThirteenEntriesInOrder)
 {
     const auto events = create({at(100,
                                    {{"session_selected_format", "lpcm, 48 kHz"},
@@ -85,7 +85,7 @@ TEST_F(VolumeMessages, SayWhatWasPlayedHowInThirteenEntriesInOrder)
         R"("mChannelsPerFrame":6,"play_secondsBucketed":"60","msgidx":1,"msgcnt":1})");
 }
 
-TEST_F(VolumeMessages, SayWhatIsAssumedWhereNothingWasSaid)
+TEST_F(SessionVolumeEvents, SayWhatIsAssumedWhereNothingWasSaid)
 {
     const auto events = create({startAt(0), stopAt(1)});
     ASSERT_THAT(events, SizeIs(1));
@@ -96,7 +96,7 @@ TEST_F(VolumeMessages, SayWhatIsAssumedWhereNothingWasSaid)
               R"("mChannelsPerFrame":-1,"play_secondsBucketed":"1","msgidx":1,"msgcnt":1})");
 }
 
-TEST_F(VolumeMessages, GiveThePlayTimeAsAFloatOf32Bits)
+TEST_F(SessionVolumeEvents, GiveThePlayTimeAsAFloatOf32Bits)
 {
     const auto events = create({startAt(1'767'225'600.1), stopAt(1'767'225'607.3)});
     ASSERT_THAT(events, SizeIs(1));
@@ -105,7 +105,7 @@ TEST_F(VolumeMessages, GiveThePlayTimeAsAFloatOf32Bits)
     EXPECT_EQ(playTime->text(), "7.2") << "the difference of the times, as doubles, has many more digits";
 }
 
-TEST_F(VolumeMessages, AreNumberedAndCounted)
+TEST_F(SessionVolumeEvents, AreNumberedAndCounted)
 {
     const auto events = create({startAt(0, 0.5), at(30, {{"PomoSessionVolume", 0.75}}), stopAt(100)});
     EXPECT_THAT(values(events, "play_seconds"), ElementsAre("30", "70"));
@@ -114,7 +114,7 @@ TEST_F(VolumeMessages, AreNumberedAndCounted)
     EXPECT_THAT(values(events, "msgcnt"), ElementsAre("2", "2"));
 }
 
-TEST_F(VolumeMessages, SayHowItWasBeforeTheMessageThatEndsTheStretch)
+TEST_F(SessionVolumeEvents, SayHowItWasBeforeTheMessageThatEndsTheStretch)
 {
     const auto events = create({startAt(0),
                                 at(10,
@@ -127,7 +127,7 @@ TEST_F(VolumeMessages, SayHowItWasBeforeTheMessageThatEndsTheStretch)
     EXPECT_THAT(values(events, "mChannelsPerFrame"), ElementsAre("-1"));
 }
 
-TEST_F(VolumeMessages, BucketVolumesToSixteenths)
+TEST_F(SessionVolumeEvents, BucketVolumesToSixteenths)
 {
     const std::vector<std::pair<Value, std::string>> expected{
         {0, "0.0"},          {0.03, "0.0"},
@@ -142,7 +142,7 @@ TEST_F(VolumeMessages, BucketVolumesToSixteenths)
             << volume.text();
 }
 
-TEST_F(VolumeMessages, BucketPlayTimes)
+TEST_F(SessionVolumeEvents, BucketPlayTimes)
 {
     const std::vector<std::pair<double, std::string>> expected{
         {0.51, "1"},    {1, "1"},          {2.9, "1"},     {3, "5"},           {7.5, "10"},    {20, "30"},
@@ -155,14 +155,14 @@ TEST_F(VolumeMessages, BucketPlayTimes)
                 ElementsAre("0"));
 }
 
-TEST_F(VolumeMessages, NameTheApplicationWhateverItsType)
+TEST_F(SessionVolumeEvents, NameTheApplicationWhateverItsType)
 {
     EXPECT_THAT(values(create({startAt(0), stopAt(1)}, Value(7)), "HostApplicationDisplayID"), ElementsAre("7"));
 }
 
 // --- which stretches count
 
-TEST_F(VolumeMessages, CountOnlyStretchesLongerThanTheMinimum)
+TEST_F(SessionVolumeEvents, CountOnlyStretchesLongerThanTheMinimum)
 {
     EXPECT_THAT(create({startAt(10), stopAt(10.4)}), IsEmpty());
     EXPECT_THAT(create({startAt(10), stopAt(10.5)}), IsEmpty());
@@ -171,36 +171,36 @@ TEST_F(VolumeMessages, CountOnlyStretchesLongerThanTheMinimum)
     EXPECT_THAT(create({startAt(10), stopAt(5)}, Value("player"), -6), SizeIs(1));
 }
 
-TEST_F(VolumeMessages, CountNothingOfWhatIsNoTime)
+TEST_F(SessionVolumeEvents, CountNothingOfWhatIsNoTime)
 {
     EXPECT_THAT(create({startAt(nan), stopAt(10)}), IsEmpty());
     EXPECT_THAT(create({startAt(10), stopAt(nan)}), IsEmpty());
 }
 
-TEST_F(VolumeMessages, NeedAnApplication)
+TEST_F(SessionVolumeEvents, NeedAnApplication)
 {
     EXPECT_THAT(create({startAt(0), at(30, {{"PomoSessionVolume", 0.75}}), stopAt(100)}, std::nullopt), IsEmpty());
 }
 
-TEST_F(VolumeMessages, NeedAVolume)
+TEST_F(SessionVolumeEvents, NeedAVolume)
 {
     EXPECT_THAT(create({at(0, {{"session_output_running", true}}), stopAt(10)}), IsEmpty());
     EXPECT_THAT(create({at(0, {{"session_output_running", true}}), stopAt(10), startAt(20), stopAt(30)}), SizeIs(1));
 }
 
-TEST_F(VolumeMessages, AreNothingWhenNothingRan)
+TEST_F(SessionVolumeEvents, AreNothingWhenNothingRan)
 {
     EXPECT_THAT(create({}), IsEmpty());
     EXPECT_THAT(create({stopAt(1), at(2, {{"PomoSessionVolume", 0.5}}), at(30, {{"PomoSessionVolume", 0.6}}), {}}),
                 IsEmpty());
 }
 
-TEST_F(VolumeMessages, AreNothingWhileTheStretchGoesOn)
+TEST_F(SessionVolumeEvents, AreNothingWhileTheStretchGoesOn)
 {
     EXPECT_THAT(create({startAt(0), at(100, {{"mChannelsPerFrame", 2}})}), IsEmpty());
 }
 
-TEST_F(VolumeMessages, NeedTimes)
+TEST_F(SessionVolumeEvents, NeedTimes)
 {
     EXPECT_THAT(create({{{"session_output_running", true}, {"PomoSessionVolume", 0.5}},
                         {{"PomoSessionVolume", 0.75}},
@@ -211,21 +211,21 @@ TEST_F(VolumeMessages, NeedTimes)
 
 // --- what ends a stretch
 
-TEST_F(VolumeMessages, EndWithTheSession)
+TEST_F(SessionVolumeEvents, EndWithTheSession)
 {
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"session_duration", 10}})}), ElementsAre("10"));
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"session_duration", Value()}})}), ElementsAre("10"))
         << "whatever the duration is";
 }
 
-TEST_F(VolumeMessages, EndWithTheSessionEvenWhenOutputIsSaidToRun)
+TEST_F(SessionVolumeEvents, EndWithTheSessionEvenWhenOutputIsSaidToRun)
 {
     EXPECT_THAT(
         playTimes({startAt(0), at(10, {{"session_duration", 10}, {"session_output_running", true}}), stopAt(15)}),
         ElementsAre("10", "5"));
 }
 
-TEST_F(VolumeMessages, CountFromZeroAfterTheEndOfASessionThatNeverStopped)
+TEST_F(SessionVolumeEvents, CountFromZeroAfterTheEndOfASessionThatNeverStopped)
 {
     // The end clears the begin of the stretch, but what the state knows is still that output runs.
     EXPECT_THAT(playTimes({startAt(100), at(110, {{"session_duration", 10}}), startAt(120), stopAt(130)}),
@@ -234,7 +234,7 @@ TEST_F(VolumeMessages, CountFromZeroAfterTheEndOfASessionThatNeverStopped)
                 ElementsAre("10", "115"));
 }
 
-TEST_F(VolumeMessages, EndWhenOneOfFiveThingsChanges)
+TEST_F(SessionVolumeEvents, EndWhenOneOfFiveThingsChanges)
 {
     const std::vector<std::pair<const char*, std::pair<Value, Value>>> changes{
         {"session_selected_format", {"lpcm", "aac"}},
@@ -255,7 +255,7 @@ TEST_F(VolumeMessages, EndWhenOneOfFiveThingsChanges)
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"spatializationEnabled", false}}), stopAt(30)}), ElementsAre("30"));
 }
 
-TEST_F(VolumeMessages, DoNotEndWhenTheAccessorySettingOrTheChannelsChange)
+TEST_F(SessionVolumeEvents, DoNotEndWhenTheAccessorySettingOrTheChannelsChange)
 {
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"spatial-audio-accessory-feature", true}}),
                            at(20, {{"mChannelsPerFrame", 6}, {"else", 1}}), stopAt(30)}),
@@ -266,7 +266,7 @@ TEST_F(VolumeMessages, DoNotEndWhenTheAccessorySettingOrTheChannelsChange)
     EXPECT_THAT(values(events, "mChannelsPerFrame"), ElementsAre("6"));
 }
 
-TEST_F(VolumeMessages, DoNotEndWhenTheVolumeIsFirstHeardOf)
+TEST_F(SessionVolumeEvents, DoNotEndWhenTheVolumeIsFirstHeardOf)
 {
     const auto events =
         create({at(0, {{"session_output_running", true}}), at(10, {{"PomoSessionVolume", 0.5}}), stopAt(30)});
@@ -274,12 +274,12 @@ TEST_F(VolumeMessages, DoNotEndWhenTheVolumeIsFirstHeardOf)
     EXPECT_THAT(values(events, "PomoSessionVolume"), ElementsAre("0.5"));
 }
 
-TEST_F(VolumeMessages, DoNotEndWhenOutputIsSaidToRunAgain)
+TEST_F(SessionVolumeEvents, DoNotEndWhenOutputIsSaidToRunAgain)
 {
     EXPECT_THAT(playTimes({startAt(0), startAt(10), stopAt(30)}), ElementsAre("30"));
 }
 
-TEST_F(VolumeMessages, TakeNoNoticeOfChangesWhileNothingRuns)
+TEST_F(SessionVolumeEvents, TakeNoNoticeOfChangesWhileNothingRuns)
 {
     const auto events = create({at(0, {{"PomoSessionVolume", 0.1}}), at(5, {{"PomoSessionVolume", 0.2}}),
                                 at(10, {{"session_output_running", true}, {"PomoSessionVolume", 0.3}}), stopAt(30),
@@ -288,19 +288,19 @@ TEST_F(VolumeMessages, TakeNoNoticeOfChangesWhileNothingRuns)
     EXPECT_THAT(values(events, "PomoSessionVolume"), ElementsAre("0.3"));
 }
 
-TEST_F(VolumeMessages, EndOnceForSeveralChangesInOneMessage)
+TEST_F(SessionVolumeEvents, EndOnceForSeveralChangesInOneMessage)
 {
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"PomoSessionVolume", 1}, {"ringerstate", 1}, {"active_devices", "x"}}),
                            stopAt(30)}),
                 ElementsAre("10", "20"));
 }
 
-TEST_F(VolumeMessages, CountTheNextStretchFromTheChangeEvenWhenTheOneBeforeWasTooShort)
+TEST_F(SessionVolumeEvents, CountTheNextStretchFromTheChangeEvenWhenTheOneBeforeWasTooShort)
 {
     EXPECT_THAT(playTimes({startAt(0), at(0.25, {{"PomoSessionVolume", 1}}), stopAt(30)}), ElementsAre("29.75"));
 }
 
-TEST_F(VolumeMessages, TakeABurstOfSwitchesForOneMessage)
+TEST_F(SessionVolumeEvents, TakeABurstOfSwitchesForOneMessage)
 {
     // On and off within the pause: nothing changed, and the burst's time is that of its last message.
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"spatializationEnabled", true}}),
@@ -314,7 +314,7 @@ TEST_F(VolumeMessages, TakeABurstOfSwitchesForOneMessage)
                 ElementsAre("10", "2.5", "17.5"));
 }
 
-TEST_F(VolumeMessages, SeeABurstBeforeWhatCameBetweenItsMessages)
+TEST_F(SessionVolumeEvents, SeeABurstBeforeWhatCameBetweenItsMessages)
 {
     // The switch that comes at 21 belongs to the burst of 20 and is seen there: output stops before the volume changes.
     const auto events =
@@ -326,7 +326,7 @@ TEST_F(VolumeMessages, SeeABurstBeforeWhatCameBetweenItsMessages)
 
 // --- values of the wrong type
 
-TEST_F(VolumeMessages, TakeNumbersAndTextsForTruthValues)
+TEST_F(SessionVolumeEvents, TakeNumbersAndTextsForTruthValues)
 {
     const auto playTimesWith = [](const Value& on, const Value& off) {
         return playTimes({at(0, {{"session_output_running", on}, {"PomoSessionVolume", 0.5}}),
@@ -342,7 +342,7 @@ TEST_F(VolumeMessages, TakeNumbersAndTextsForTruthValues)
     EXPECT_THAT(playTimesWith(true, 2), IsEmpty());
 }
 
-TEST_F(VolumeMessages, CompareRingerAndSpatializationAsNumbers)
+TEST_F(SessionVolumeEvents, CompareRingerAndSpatializationAsNumbers)
 {
     const auto ends = [](const Value& before, const Value& after) {
         return create({startAt(0), at(1, {{"ringerstate", before}}), at(10, {{"ringerstate", after}}), stopAt(30)})
@@ -362,7 +362,7 @@ TEST_F(VolumeMessages, CompareRingerAndSpatializationAsNumbers)
     EXPECT_TRUE(ends(nan, nan)) << "which equals nothing";
 }
 
-TEST_F(VolumeMessages, CompareFormatsAndDevicesAsTexts)
+TEST_F(SessionVolumeEvents, CompareFormatsAndDevicesAsTexts)
 {
     const auto ends = [](const Value& before, const Value& after) {
         return create(
@@ -381,7 +381,7 @@ TEST_F(VolumeMessages, CompareFormatsAndDevicesAsTexts)
     EXPECT_FALSE(ends(foundation::Array{1, 2}, "[1,2]"));
 }
 
-TEST_F(VolumeMessages, CompareVolumesAsObjects)
+TEST_F(SessionVolumeEvents, CompareVolumesAsObjects)
 {
     const auto ends = [](const Value& before, const Value& after) {
         return create({startAt(0, before), at(10, {{"PomoSessionVolume", after}}), stopAt(30)}).size() == 2;
@@ -394,14 +394,14 @@ TEST_F(VolumeMessages, CompareVolumesAsObjects)
     EXPECT_FALSE(ends(Value(), Value()));
 }
 
-TEST_F(VolumeMessages, ReadTimesThatAreTexts)
+TEST_F(SessionVolumeEvents, ReadTimesThatAreTexts)
 {
     EXPECT_THAT(playTimes({startAt("10.5 s"), stopAt(" +20.5")}), ElementsAre("10"));
     EXPECT_THAT(playTimes({startAt("soon"), stopAt("20.5")}), ElementsAre("20.5"));
     EXPECT_THAT(playTimes({startAt(foundation::Date{5}), stopAt(true)}), ElementsAre("1"));
 }
 
-TEST_F(VolumeMessages, CarryValuesOfTheWrongTypeAsTheyAre)
+TEST_F(SessionVolumeEvents, CarryValuesOfTheWrongTypeAsTheyAre)
 {
     const Dictionary odd{{"session_selected_format", foundation::Array{1, "a"}},
                          {"active_devices", Value()},
@@ -418,7 +418,7 @@ TEST_F(VolumeMessages, CarryValuesOfTheWrongTypeAsTheyAre)
 
 // --- what is logged
 
-TEST_F(VolumeMessages, SayInTheLogWhatTheyAddAndSkip)
+TEST_F(SessionVolumeEvents, SayInTheLogWhatTheyAddAndSkip)
 {
     create({startAt(0), at(0.25, {{"PomoSessionVolume", 0.6}}), at(10, {{"PomoSessionVolume", 0.7}}), stopAt(20),
             startAt(30), stopAt(30.5)});
@@ -438,7 +438,7 @@ TEST_F(VolumeMessages, SayInTheLogWhatTheyAddAndSkip)
     }
 }
 
-TEST_F(VolumeMessages, SaySkippedInTheSameWordsForWantOfApplicationOrVolume)
+TEST_F(SessionVolumeEvents, SaySkippedInTheSameWordsForWantOfApplicationOrVolume)
 {
     const std::string function = "+[KestoReportingSession createVolumeMessages:process:minimumPlaytime:]";
     const auto lines = ElementsAre(
@@ -451,7 +451,7 @@ TEST_F(VolumeMessages, SaySkippedInTheSameWordsForWantOfApplicationOrVolume)
     EXPECT_THAT(platform.log.take(), lines);
 }
 
-TEST_F(VolumeMessages, SayThatTheyReturnNothing)
+TEST_F(SessionVolumeEvents, SayThatTheyReturnNothing)
 {
     create({});
     EXPECT_THAT(platform.log.lines(),
@@ -482,7 +482,7 @@ RC_GTEST_PROP(VolumeMessagesOfAnyStore, AreWhatTheirDefinitionMakesOfIt, ())
     }
 }
 
-TEST_F(VolumeMessages, ComeFromHundredsOfThousandsOfMessagesInOrder)
+TEST_F(SessionVolumeEvents, ComeFromHundredsOfThousandsOfMessagesInOrder)
 {
     Messages payloads;
     for (int second = 0; second < 200'000; ++second)
@@ -494,7 +494,7 @@ TEST_F(VolumeMessages, ComeFromHundredsOfThousandsOfMessagesInOrder)
     EXPECT_EQ(*events.back().find("play_seconds"), Value(50));
 }
 
-TEST_F(VolumeMessages, ComeFromABurstOfHundredsOfThousandsOfMessages)
+TEST_F(SessionVolumeEvents, ComeFromABurstOfHundredsOfThousandsOfMessages)
 {
     Messages payloads{startAt(0)};
     for (int message = 0; message < 200'000; ++message)
@@ -505,7 +505,7 @@ TEST_F(VolumeMessages, ComeFromABurstOfHundredsOfThousandsOfMessages)
 
 // --- and what they cost
 
-TEST_F(VolumeMessages, ShareWhatAClientSaidOnce)
+TEST_F(SessionVolumeEvents, ShareWhatAClientSaidOnce)
 {
     const std::string large(std::size_t{1} << 20, 'x');
     Messages payloads{startAt(0).mergedWith({{"active_devices", large}})};
@@ -522,7 +522,7 @@ TEST_F(VolumeMessages, ShareWhatAClientSaidOnce)
 }
 
 // Each would be written to the store and twice to the disk.
-TEST_F(VolumeMessages, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
+TEST_F(SessionVolumeEvents, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
 {
     constexpr std::size_t size = std::size_t{1} << 20;
     constexpr int changes = 100;
@@ -568,14 +568,14 @@ void expectToPayForWhatTheyTake(const session::MessageStore& store, std::size_t 
     EXPECT_EQ(events.size(), count);
 }
 
-TEST_F(VolumeMessages, ArePaidForWithWhatTheyTake)
+TEST_F(SessionVolumeEvents, ArePaidForWithWhatTheyTake)
 {
     KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
     platform.log.setThreshold(Error);
     expectToPayForWhatTheyTake(*storeOfVolumeChanges(200'000), 200'000);
 }
 
-TEST_F(VolumeMessages, ArePaidForWithWhatTheyTakeWhenEachHasATextOfItsOwn)
+TEST_F(SessionVolumeEvents, ArePaidForWithWhatTheyTakeWhenEachHasATextOfItsOwn)
 {
     KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
     platform.log.setThreshold(Error);
@@ -587,7 +587,7 @@ TEST_F(VolumeMessages, ArePaidForWithWhatTheyTakeWhenEachHasATextOfItsOwn)
     expectToPayForWhatTheyTake(*storeOf(payloads), 50'000);
 }
 
-TEST_F(VolumeMessages, StayWithinTheirBound)
+TEST_F(SessionVolumeEvents, StayWithinTheirBound)
 {
     KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
     platform.log.setThreshold(Error);
@@ -601,7 +601,7 @@ TEST_F(VolumeMessages, StayWithinTheirBound)
     EXPECT_LT(events.size(), 300'000U);
 }
 
-TEST_F(VolumeMessages, ShareTheirKeys)
+TEST_F(SessionVolumeEvents, ShareTheirKeys)
 {
     const auto events = create({startAt(0), at(30, {{"PomoSessionVolume", 0.75}}), stopAt(100)});
     ASSERT_THAT(events, SizeIs(2));
@@ -610,7 +610,7 @@ TEST_F(VolumeMessages, ShareTheirKeys)
     EXPECT_EQ(later.at(0).shape().get(), events[0].shape().get());
 }
 
-TEST_F(VolumeMessages, ArePaidForAsLongAsTheShareIsThere)
+TEST_F(SessionVolumeEvents, ArePaidForAsLongAsTheShareIsThere)
 {
     const auto budget = std::make_shared<session::StorageBudget>(std::size_t{1} << 30);
     const auto store = storeOfVolumeChanges(10'000);
@@ -623,7 +623,7 @@ TEST_F(VolumeMessages, ArePaidForAsLongAsTheShareIsThere)
     EXPECT_EQ(budget->taken(), 0U);
 }
 
-TEST_F(VolumeMessages, AreLostWhenTheBudgetHasNoRoomForThem)
+TEST_F(SessionVolumeEvents, AreLostWhenTheBudgetHasNoRoomForThem)
 {
     const auto budget = std::make_shared<session::StorageBudget>(std::size_t{1} << 20);
     const auto store = storeOfVolumeChanges(10'000);
@@ -641,7 +641,7 @@ TEST_F(VolumeMessages, AreLostWhenTheBudgetHasNoRoomForThem)
 }
 
 // Only one session ends at a time, so that a few take nothing from anybody.
-TEST_F(VolumeMessages, AreThereInSmallNumbersEvenWhenTheBudgetIsUsedUp)
+TEST_F(SessionVolumeEvents, AreThereInSmallNumbersEvenWhenTheBudgetIsUsedUp)
 {
     session::StorageShare share(std::make_shared<session::StorageBudget>(0));
     const auto store = storeOfVolumeChanges(50);

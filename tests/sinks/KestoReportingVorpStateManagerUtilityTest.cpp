@@ -25,9 +25,9 @@ Dictionary hapticTime(const Value& seconds)
     return {{"Haptic_Active_Hardware_Time_Seconds", seconds}};
 }
 
-class GivenSession final : public sinks::SinkSession {
+class SessionOfServiceType final : public sinks::SinkSession {
 public:
-    explicit GivenSession(AudioServiceType serviceType) : serviceType_(serviceType) { }
+    explicit SessionOfServiceType(AudioServiceType serviceType) : serviceType_(serviceType) { }
     [[nodiscard]] AudioServiceType serviceType() const override { return serviceType_; }
     [[nodiscard]] Dictionary configuration() const override { return {}; }
 
@@ -40,7 +40,7 @@ protected:
     void send(const std::optional<Dictionary>& message, AudioEventType type = gimbo,
               AudioEventCategory category = playback)
     {
-        manager.handleEvent(message, category, type, std::make_shared<GivenSession>(serviceType), "player");
+        manager.handleEvent(message, category, type, std::make_shared<SessionOfServiceType>(serviceType), "player");
     }
     void expectNothingHappened()
     {
@@ -114,7 +114,8 @@ TEST_F(VorpStateManagerTest, CountsForEveryTime)
     const Value times[] = {0, -1, "text", Value(), false, std::numeric_limits<double>::quiet_NaN(), Array{1}};
     for (const Value& time : times) {
         KestoReportingUtilityVorpStateManager fresh;
-        fresh.handleEvent(hapticTime(time), playback, gimbo, std::make_shared<GivenSession>(serviceType), "player");
+        fresh.handleEvent(hapticTime(time), playback, gimbo, std::make_shared<SessionOfServiceType>(serviceType),
+                          "player");
         EXPECT_EQ(fresh.leakedHapticsSessionCounter(), 1U) << time.text();
     }
 }
@@ -242,7 +243,7 @@ TEST_F(VorpStateManagerTest, NamesTheServiceAndTheWholeCategoryOfTheReportThatFi
 
 TEST_F(VorpStateManagerTest, NamesTheProcessThatSentTheReportThatFires)
 {
-    const auto session = std::make_shared<GivenSession>(serviceType);
+    const auto session = std::make_shared<SessionOfServiceType>(serviceType);
     manager.handleEvent(a, playback, gimbo, session, "first");
     manager.handleEvent(b, playback, gimbo, session, "second");
     ASSERT_THAT(snapshots(), SizeIs(1));
@@ -279,7 +280,7 @@ TEST_F(VorpStateManagerTest, TheAnswerMayComeWhenTheManagerIsGone)
 {
     {
         KestoReportingUtilityVorpStateManager other;
-        const auto session = std::make_shared<GivenSession>(serviceType);
+        const auto session = std::make_shared<SessionOfServiceType>(serviceType);
         other.handleEvent(a, playback, gimbo, session, "player");
         other.handleEvent(b, playback, gimbo, session, "player");
     }

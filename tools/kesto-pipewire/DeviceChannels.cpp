@@ -2,7 +2,7 @@
 #include "kesto-pipewire/DeviceChannels.h"
 
 #include "kesto-pipewire/DriverName.h"
-#include "kesto-pipewire/Text.h"
+#include "kesto-pipewire/ValidText.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -2,7 +2,7 @@
 // are few links, and so the state is always consistent.
 #include "kesto-pipewire/Graph.h"
 
-#include "kesto-pipewire/Text.h"
+#include "kesto-pipewire/ValidText.h"
 
 #include <algorithm>
 #include <set>

@@ -83,7 +83,7 @@ void Observer::connect()
 {
     if (connection_)
         return;
-    connection_ = Connection::open(*context_, remote_, graph_, [this] {
+    connection_ = PipeWireConnection::open(*context_, remote_, graph_, [this] {
         lostAt_ = currentMoment();
         loop_.wake(loss_);
     });

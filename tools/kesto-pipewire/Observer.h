@@ -4,11 +4,11 @@
 // socket wakes the observer at once, and a timer with growing pauses covers a missed appearance.
 #pragma once
 
-#include "kesto-pipewire/Connection.h"
 #include "kesto-pipewire/Diagnostics.h"
 #include "kesto-pipewire/FileWatch.h"
 #include "kesto-pipewire/Graph.h"
 #include "kesto-pipewire/Loop.h"
+#include "kesto-pipewire/PipeWireConnection.h"
 #include "kesto-pipewire/Stream.h"
 
 #include <memory>
@@ -54,7 +54,7 @@ private:
     double pause_;
     std::optional<FileWatch> socketWatch_;
     std::unique_ptr<pw_context, Release> context_;
-    std::unique_ptr<Connection> connection_;
+    std::unique_ptr<PipeWireConnection> connection_;
 };
 
 } // namespace kesto_pipewire

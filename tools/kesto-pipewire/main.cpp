@@ -6,10 +6,10 @@
 
 #include "kesto-pipewire/DeviceChannels.h"
 #include "kesto-pipewire/Diagnostics.h"
+#include "kesto-pipewire/LibkestoService.h"
 #include "kesto-pipewire/Loop.h"
 #include "kesto-pipewire/Observer.h"
 #include "kesto-pipewire/Reporter.h"
-#include "kesto-pipewire/ServiceConnection.h"
 
 #include <CLI/CLI.hpp>
 #include <pipewire/pipewire.h>
@@ -28,7 +28,7 @@ namespace {
 
 constexpr int exitUndelivered = 1;
 
-struct Options {
+struct CommandLine {
     std::string socket;
     std::string remote;
     std::string channels;
@@ -57,7 +57,7 @@ ReporterID firstReporterID()
     return (ReporterID{getpid()} << 24) + 1;
 }
 
-int run(const Options& options)
+int run(const CommandLine& options)
 {
     const Diagnostics diagnostics(options.verbose);
     const Library library;
@@ -68,7 +68,7 @@ int run(const Options& options)
 
     // Before the connection, so that a service that the connection starts finds the channels.
     DeviceChannels channels(options.channels, diagnostics);
-    ServiceConnection service(loop, options.socket, diagnostics);
+    LibkestoService service(loop, options.socket, diagnostics);
     Source alarm;
     const auto setAlarm = [&](std::optional<double> uptime) {
         if (uptime)
@@ -94,7 +94,7 @@ int run(const Options& options)
 
 int main(int argumentCount, char** arguments)
 {
-    kesto_pipewire::Options options;
+    kesto_pipewire::CommandLine options;
     CLI::App app("Reports every stream of a running PipeWire to the Kesto reporting service.", "kesto-pipewire");
     app.add_option("--socket", options.socket, "Socket of the reporting service")->type_name("PATH");
     app.add_option("--remote", options.remote, "Name or socket of the PipeWire server")->type_name("NAME");

@@ -84,8 +84,8 @@ Made makeHistogram(libkesto::Doorbell& bell, const char* unit, std::span<const s
         text = libkesto::channelText(unit);
     if (!text)
         return std::unexpected(text.error());
-    return std::make_unique<libkesto::HistogramChannel>(bell, *std::move(text),
-                                                        std::vector(bounds.begin(), bounds.end()));
+    return std::make_unique<libkesto::HistogramChannelValue>(bell, *std::move(text),
+                                                             std::vector(bounds.begin(), bounds.end()));
 }
 
 Made makeState(libkesto::Doorbell& bell, std::span<const char* const> states, std::size_t first)
@@ -103,7 +103,7 @@ Made makeState(libkesto::Doorbell& bell, std::span<const char* const> states, st
     }
     if (std::set(names.begin(), names.end()).size() < names.size())
         return std::unexpected(KESTO_INVALID_ARGUMENT);
-    return std::make_unique<libkesto::StateChannel>(bell, std::move(names), first, ChannelClock::now());
+    return std::make_unique<libkesto::StateChannelValue>(bell, std::move(names), first, ChannelClock::now());
 }
 
 } // namespace
@@ -155,7 +155,7 @@ kesto_status kesto_channel_create_simple(kesto_publisher* publisher, const kesto
                                          kesto_channel** channel)
 {
     return create(publisher, name, channel,
-                  [](libkesto::Doorbell& bell) { return Made(std::make_unique<libkesto::SimpleChannel>(bell)); });
+                  [](libkesto::Doorbell& bell) { return Made(std::make_unique<libkesto::SimpleChannelValue>(bell)); });
 }
 
 kesto_status kesto_channel_create_histogram(kesto_publisher* publisher, const kesto_channel_name* name,

@@ -66,8 +66,9 @@ kesto_options completed(const kesto_options* given) noexcept
     return options;
 }
 
-libkesto::Settings settings(const kesto_options& options, std::vector<std::string> paths,
-                            libkesto::StateListener listener, std::unique_ptr<libkesto::AttachableEmitter> emitter)
+libkesto::ClientSettings settings(const kesto_options& options, std::vector<std::string> paths,
+                                  libkesto::StateListener listener,
+                                  std::unique_ptr<libkesto::AttachableEmitter> emitter)
 {
     const std::size_t queueBytes =
         std::clamp(orDefault(options.queue_bytes, defaultQueueBytes), leastQueueBytes, mostQueueBytes);

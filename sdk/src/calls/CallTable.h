@@ -7,7 +7,7 @@
 
 #include "Callback.h"
 #include "Counters.h"
-#include "wire/Wire.h"
+#include "wire/CallFrames.h"
 
 #include <cstdint>
 #include <map>

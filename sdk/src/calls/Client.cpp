@@ -1,7 +1,7 @@
 // What is checked before a message is taken, and in which order things go when a client goes.
 #include "calls/Client.h"
 
-#include "Threads.h"
+#include "SignalFreeThread.h"
 #include "client/ServiceOperations.h"
 
 #include <algorithm>

@@ -2,8 +2,8 @@
 // out again.
 #pragma once
 
+#include "ClientSettings.h"
 #include "Counters.h"
-#include "Settings.h"
 #include "calls/Courier.h"
 #include "calls/Flushes.h"
 #include "calls/Mailbox.h"
@@ -20,7 +20,7 @@
 // The opaque type of the interface. Any thread.
 struct kesto_client final {
 public:
-    using Settings = libkesto::Settings;
+    using Settings = libkesto::ClientSettings;
     using CallHead = libkesto::CallHead;
 
     // Null, with `errno`, when the system has no descriptor. May throw std::bad_alloc.

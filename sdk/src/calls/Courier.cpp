@@ -16,7 +16,7 @@ constexpr std::uint64_t traceRequest = 0; // its number; those of calls begin wi
 
 } // namespace
 
-Courier::Courier(Settings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters)
+Courier::Courier(ClientSettings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters)
     : settings_(std::move(settings)),
       mailbox_(mailbox),
       flushes_(flushes),

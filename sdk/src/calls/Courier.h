@@ -5,8 +5,8 @@
 // of the change: whoever hears of it starts from nothing.
 #pragma once
 
+#include "ClientSettings.h"
 #include "Counters.h"
-#include "Settings.h"
 #include "calls/CallTable.h"
 #include "calls/Flushes.h"
 #include "calls/Mailbox.h"
@@ -34,7 +34,7 @@ public:
     // No further calls are taken while so much waits for the socket to take it.
     static constexpr std::size_t mostUnsentBytes = 64 * 1024;
 
-    Courier(Settings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters);
+    Courier(ClientSettings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters);
     // Answers what callers put in after `run` had ended. The thread that frees the client.
     ~Courier();
 
@@ -76,7 +76,7 @@ private:
     [[nodiscard]] bool looksByItself() const noexcept;
     void changeState(kesto_state state, ConnectionFailure failure = {KESTO_OK});
 
-    const Settings settings_;
+    const ClientSettings settings_;
     Mailbox& mailbox_;
     Flushes& flushes_;
     Counters& counters_;

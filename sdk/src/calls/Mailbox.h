@@ -12,7 +12,7 @@
 #include "Doorbell.h"
 #include "calls/CallQueue.h"
 #include "platform/linux/files/FileDescriptor.h"
-#include "wire/Wire.h"
+#include "wire/CallFrames.h"
 
 #include <atomic>
 #include <cstddef>

@@ -14,26 +14,26 @@ using Limits = std::numeric_limits<std::int64_t>;
 
 } // namespace
 
-kesto_status SimpleChannel::add(std::int64_t amount) noexcept
+kesto_status SimpleChannelValue::add(std::int64_t amount) noexcept
 {
     value_.fetch_add(amount);
     changed();
     return KESTO_OK;
 }
 
-kesto_status SimpleChannel::set(std::int64_t value) noexcept
+kesto_status SimpleChannelValue::set(std::int64_t value) noexcept
 {
     value_.store(value);
     changed();
     return KESTO_OK;
 }
 
-void SimpleChannel::appendText(std::string& text, Time)
+void SimpleChannelValue::appendText(std::string& text, Time)
 {
     foundation::format_to(std::back_inserter(text), "simple\n{}\n", value_.load());
 }
 
-HistogramChannel::HistogramChannel(Doorbell& bell, std::string unit, std::vector<std::int64_t> bounds)
+HistogramChannelValue::HistogramChannelValue(Doorbell& bell, std::string unit, std::vector<std::int64_t> bounds)
     : kesto_channel(bell),
       unit_(std::move(unit)),
       bounds_(std::move(bounds)),
@@ -43,13 +43,13 @@ HistogramChannel::HistogramChannel(Doorbell& bell, std::string unit, std::vector
 {
 }
 
-std::size_t HistogramChannel::bucketOf(std::int64_t value) const noexcept
+std::size_t HistogramChannelValue::bucketOf(std::int64_t value) const noexcept
 {
     const auto above = std::upper_bound(bounds_.begin() + 1, bounds_.end() - 1, value);
     return static_cast<std::size_t>(above - bounds_.begin()) - 1;
 }
 
-kesto_status HistogramChannel::record(std::int64_t value) noexcept
+kesto_status HistogramChannelValue::record(std::int64_t value) noexcept
 {
     for (std::int64_t least = minimum_.load(); value < least && !minimum_.compare_exchange_weak(least, value);) { }
     for (std::int64_t most = maximum_.load(); value > most && !maximum_.compare_exchange_weak(most, value);) { }
@@ -58,7 +58,7 @@ kesto_status HistogramChannel::record(std::int64_t value) noexcept
     return KESTO_OK;
 }
 
-void HistogramChannel::appendText(std::string& text, Time)
+void HistogramChannelValue::appendText(std::string& text, Time)
 {
     const auto out = std::back_inserter(text);
     foundation::format_to(out, "histogram{}{}\n", unit_.empty() ? "" : " ", unit_);
@@ -68,7 +68,7 @@ void HistogramChannel::appendText(std::string& text, Time)
         foundation::format_to(out, "{} {} {}\n", bounds_[bucket], bounds_[bucket + 1], hits_[bucket].load());
 }
 
-StateChannel::StateChannel(Doorbell& bell, std::vector<std::string> names, std::size_t first, Time now)
+StateChannelValue::StateChannelValue(Doorbell& bell, std::vector<std::string> names, std::size_t first, Time now)
     : kesto_channel(bell),
       begin_(now),
       states_(names.size()),
@@ -79,13 +79,13 @@ StateChannel::StateChannel(Doorbell& bell, std::vector<std::string> names, std::
     states_[first].transitions.store(1);
 }
 
-std::uint64_t StateChannel::microsecondsAt(Time now) const noexcept
+std::uint64_t StateChannelValue::microsecondsAt(Time now) const noexcept
 {
     const auto since = std::chrono::duration_cast<std::chrono::microseconds>(now - begin_).count();
     return since > 0 ? static_cast<std::uint64_t>(since) : 0;
 }
 
-kesto_status StateChannel::enter(std::size_t state, Time now) noexcept
+kesto_status StateChannelValue::enter(std::size_t state, Time now) noexcept
 {
     if (state >= states_.size())
         return KESTO_INVALID_ARGUMENT;
@@ -106,7 +106,7 @@ kesto_status StateChannel::enter(std::size_t state, Time now) noexcept
 
 // The present state gets its time when it is left. A reader must not count that time twice, so it checks that the state
 // did not change while it read; a time that is not added yet merely comes later.
-std::optional<StateChannel::Present> StateChannel::readTimes()
+std::optional<StateChannelValue::Present> StateChannelValue::readTimes()
 {
     constexpr int mostAttempts = 100;
     for (int attempt = 0; attempt < mostAttempts; ++attempt) {
@@ -120,7 +120,7 @@ std::optional<StateChannel::Present> StateChannel::readTimes()
     return std::nullopt;
 }
 
-void StateChannel::appendText(std::string& text, Time now)
+void StateChannelValue::appendText(std::string& text, Time now)
 {
     if (const auto present = readTimes()) {
         const std::uint64_t moment = microsecondsAt(now);

@@ -69,7 +69,7 @@ private:
 
 namespace libkesto {
 
-class SimpleChannel final : public kesto_channel {
+class SimpleChannelValue final : public kesto_channel {
 public:
     using kesto_channel::kesto_channel;
 
@@ -81,10 +81,10 @@ private:
     std::atomic<std::int64_t> value_ = 0;
 };
 
-class HistogramChannel final : public kesto_channel {
+class HistogramChannelValue final : public kesto_channel {
 public:
     // The bounds ascend.
-    HistogramChannel(Doorbell& bell, std::string unit, std::vector<std::int64_t> bounds);
+    HistogramChannelValue(Doorbell& bell, std::string unit, std::vector<std::int64_t> bounds);
 
     kesto_status record(std::int64_t value) noexcept override;
     void appendText(std::string& text, Time now) override;
@@ -99,9 +99,9 @@ private:
     std::atomic<std::int64_t> maximum_;
 };
 
-class StateChannel final : public kesto_channel {
+class StateChannelValue final : public kesto_channel {
 public:
-    StateChannel(Doorbell& bell, std::vector<std::string> names, std::size_t first, Time now);
+    StateChannelValue(Doorbell& bell, std::vector<std::string> names, std::size_t first, Time now);
 
     kesto_status enter(std::size_t state, Time now) noexcept override;
     [[nodiscard]] bool isTimed() const noexcept override { return true; }

@@ -2,7 +2,7 @@
 // mark and the bell.
 #include "channels/Publisher.h"
 
-#include "Threads.h"
+#include "SignalFreeThread.h"
 #include "platform/linux/channels/ChannelOwner.h"
 
 #include <algorithm>

@@ -5,7 +5,7 @@
 #include "Counters.h"
 #include "platform/linux/connection/FrameReader.h"
 #include "platform/linux/files/FileDescriptor.h"
-#include "wire/Wire.h"
+#include "wire/CallFrames.h"
 
 #include <array>
 #include <cstdint>

@@ -1,8 +1,8 @@
 // The contract of platform/Connection.h: the order of calls and ends, the lifetimes of handlers and callers, when
 // answers leave, and late answers.
 #include "platform/contract/Contract.h"
-#include "platform/linux/connection/ConnectionClient.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/connection/SocketClient.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeConnection.h"
@@ -41,9 +41,9 @@ std::string answer(int number)
 }
 
 // A process that has connected.
-class Peer {
+class ContractPeer {
 public:
-    virtual ~Peer() = default;
+    virtual ~ContractPeer() = default;
     // Makes the calls, all in one go, and does not wait until they are taken.
     virtual void call(const std::vector<Array>& frames) = 0;
     virtual void close() = 0;
@@ -61,7 +61,7 @@ public:
     // Listens until `stop`.
     virtual void listen(platform::ConnectionListenerDelegate& delegate) = 0;
     virtual void stop() = 0;
-    [[nodiscard]] virtual std::unique_ptr<Peer> connect() = 0;
+    [[nodiscard]] virtual std::unique_ptr<ContractPeer> connect() = 0;
     // The number of the process that the peers are.
     [[nodiscard]] virtual std::int32_t peerProcess() const = 0;
     // A queue whose turns end as the service's do.
@@ -70,7 +70,7 @@ public:
     virtual void work() { }
 };
 
-class FakePeer final : public Peer {
+class FakePeer final : public ContractPeer {
 public:
     explicit FakePeer(std::shared_ptr<support::FakeConnection> connection) : connection_(std::move(connection)) { }
     void call(const std::vector<Array>& frames) override
@@ -97,7 +97,7 @@ class FakeConnectionSubject final : public ConnectionSubject {
 public:
     void listen(platform::ConnectionListenerDelegate& delegate) override { listener_.setDelegate(delegate); }
     void stop() override { listener_.stop(); }
-    [[nodiscard]] std::unique_ptr<Peer> connect() override
+    [[nodiscard]] std::unique_ptr<ContractPeer> connect() override
     {
         connections_.push_back(listener_.connect(peerProcess()));
         return std::make_unique<FakePeer>(connections_.back());
@@ -119,7 +119,7 @@ private:
     std::vector<std::shared_ptr<support::FakeConnection>> connections_;
 };
 
-class LinuxPeer final : public Peer {
+class LinuxPeer final : public ContractPeer {
 public:
     explicit LinuxPeer(const std::filesystem::path& path) : client_(path) { }
     ~LinuxPeer() override { ::shutdown(client_.descriptor(), SHUT_RDWR); } // in case that it still writes
@@ -158,7 +158,7 @@ private:
             writer_.join();
     }
 
-    support::Client client_;
+    support::SocketClient client_;
     std::jthread writer_;
 };
 
@@ -191,7 +191,7 @@ public:
         listener_->stop();
         thread_.join();
     }
-    [[nodiscard]] std::unique_ptr<Peer> connect() override { return std::make_unique<LinuxPeer>(path_); }
+    [[nodiscard]] std::unique_ptr<ContractPeer> connect() override { return std::make_unique<LinuxPeer>(path_); }
     [[nodiscard]] std::int32_t peerProcess() const override { return ::getpid(); }
     [[nodiscard]] platform::TurnQueue& serverQueue() override { return *queue_; }
 
@@ -260,14 +260,14 @@ protected:
     void listen() { subject->listen(*this); }
 
     // A peer, and the record of its connection.
-    std::pair<std::unique_ptr<Peer>, std::shared_ptr<Record>> connect()
+    std::pair<std::unique_ptr<ContractPeer>, std::shared_ptr<Record>> connect()
     {
         auto peer = subject->connect();
         const std::size_t number = connected++;
         EXPECT_TRUE(progress.waitFor([&] { return records.size() > number; }));
         return {std::move(peer), progress.look([&] { return records.at(number); })};
     }
-    std::pair<std::unique_ptr<Peer>, std::shared_ptr<Record>> listenAndConnect()
+    std::pair<std::unique_ptr<ContractPeer>, std::shared_ptr<Record>> listenAndConnect()
     {
         listen();
         return connect();
@@ -288,7 +288,7 @@ protected:
         return progress.look([&] { return record.calls.size(); });
     }
     // Returns when it is delivered.
-    void makeACall(Peer& peer, Record& record)
+    void makeACall(ContractPeer& peer, Record& record)
     {
         const std::size_t before = callsOf(record);
         peer.call({callOf(1)});

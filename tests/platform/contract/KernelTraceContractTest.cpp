@@ -139,22 +139,22 @@ public:
 };
 
 // A session and its delivered events.
-class Listener {
+class TraceListener {
 public:
-    explicit Listener(KernelTraceSubject& subject)
+    explicit TraceListener(KernelTraceSubject& subject)
         : subject_(subject),
           queue(subject.queues().makeSerialQueue("trace", {})),
           session(subject.trace().createTraceSession())
     {
         delivered_.listenTo(*session, *queue);
     }
-    ~Listener()
+    ~TraceListener()
     {
         session.reset();
         drain(); // what was on its way
     }
-    Listener(const Listener&) = delete;
-    Listener& operator=(const Listener&) = delete;
+    TraceListener(const TraceListener&) = delete;
+    TraceListener& operator=(const TraceListener&) = delete;
 
     [[nodiscard]] int filter(std::uint32_t firstCode, std::uint32_t lastCode)
     {
@@ -207,7 +207,7 @@ protected:
     // Waits until earlier work has ended.
     void settle()
     {
-        Listener fence(*subject);
+        TraceListener fence(*subject);
         ASSERT_EQ(fence.filter(0, 0xFFFFFFFF), 0);
         ASSERT_EQ(fence.session->start(fence.queue), 0);
         fence.session->end();
@@ -233,7 +233,7 @@ TEST_P(KernelTraceContract, HasSessionsOnASystemThatCan)
 
 TEST_P(KernelTraceContract, DeliversTheEventsOfTheCodesInTheOrderOfTime)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(5, 9), 0);
     ASSERT_EQ(listener.session->start(listener.queue), 0);
     for (const std::uint32_t code : {4U, 9U, 5U, 10U, 7U})
@@ -249,7 +249,7 @@ TEST_P(KernelTraceContract, DeliversTheEventsOfTheCodesInTheOrderOfTime)
 
 TEST_P(KernelTraceContract, DeliversAnEventToEveryHandlerThatFiltersForItsCode)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(1, 5), 0);
     ASSERT_EQ(listener.filter(5, 9), 0);
     ASSERT_EQ(listener.filter(7, 7), 0);
@@ -263,9 +263,9 @@ TEST_P(KernelTraceContract, DeliversAnEventToEveryHandlerThatFiltersForItsCode)
 
 TEST_P(KernelTraceContract, DeliversWhatHappensFromTheStartToTheEnd)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(0, 99), 0);
-    Listener other(*subject);
+    TraceListener other(*subject);
     ASSERT_EQ(other.filter(0, 99), 0);
     ASSERT_EQ(other.session->start(other.queue), 0);
     subject->emit(1);
@@ -283,7 +283,7 @@ TEST_P(KernelTraceContract, DeliversWhatHappensFromTheStartToTheEnd)
 
 TEST_P(KernelTraceContract, DeliversWhileASessionRuns)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(0, 99), 0);
     ASSERT_EQ(listener.session->start(listener.queue), 0);
     subject->emit(1);
@@ -293,18 +293,18 @@ TEST_P(KernelTraceContract, DeliversWhileASessionRuns)
 
 TEST_P(KernelTraceContract, TellsTheTimeOfDayToSessionsThatEnabledItOnly)
 {
-    Listener with(*subject);
-    Listener without(*subject);
-    Listener changed(*subject);
+    TraceListener with(*subject);
+    TraceListener without(*subject);
+    TraceListener changed(*subject);
     with.session->enableWallTimes(true);
     changed.session->enableWallTimes(true);
     changed.session->enableWallTimes(false);
-    for (Listener* listener : {&with, &without, &changed}) {
+    for (TraceListener* listener : {&with, &without, &changed}) {
         ASSERT_EQ(listener->filter(0, 99), 0);
         ASSERT_EQ(listener->session->start(listener->queue), 0);
     }
     subject->emit(1);
-    for (Listener* listener : {&with, &without, &changed}) {
+    for (TraceListener* listener : {&with, &without, &changed}) {
         listener->session->end();
         ASSERT_TRUE(listener->waitForCompletion());
         ASSERT_EQ(listener->events().size(), 1U);
@@ -342,7 +342,7 @@ TEST_P(KernelTraceContract, TellsInTheCompletionHandlerHowManyEventsWereLostWhil
 
 TEST_P(KernelTraceContract, CompletesASessionOnceHoweverOftenItIsEnded)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(0, 99), 0);
     ASSERT_EQ(listener.session->start(listener.queue), 0);
     listener.session->end();
@@ -356,7 +356,7 @@ TEST_P(KernelTraceContract, CompletesASessionOnceHoweverOftenItIsEnded)
 
 TEST_P(KernelTraceContract, CompletesASessionWithoutFilters)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.session->start(listener.queue), 0);
     subject->emit(1);
     listener.session->end();
@@ -365,7 +365,7 @@ TEST_P(KernelTraceContract, CompletesASessionWithoutFilters)
 
 TEST_P(KernelTraceContract, CompletesASessionThatCouldNotBeStartedWhenItIsEnded)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(0, 99), 0);
     if (!subject->refuseToStart())
         GTEST_SKIP() << "the kernel does not refuse";
@@ -383,7 +383,7 @@ TEST_P(KernelTraceContract, CompletesASessionThatCouldNotBeStartedWhenItIsEnded)
 
 TEST_P(KernelTraceContract, CompletesNoSessionThatWasNeverStarted)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(0, 99), 0);
     listener.session->end();
     settle();
@@ -393,10 +393,10 @@ TEST_P(KernelTraceContract, CompletesNoSessionThatWasNeverStarted)
 
 TEST_P(KernelTraceContract, NeverCompletesASessionThatIsDestroyedBefore)
 {
-    Listener running(*subject);
-    Listener ended(*subject);
-    Listener complete(*subject);
-    for (Listener* listener : {&running, &ended, &complete}) {
+    TraceListener running(*subject);
+    TraceListener ended(*subject);
+    TraceListener complete(*subject);
+    for (TraceListener* listener : {&running, &ended, &complete}) {
         ASSERT_EQ(listener->filter(0, 99), 0);
         ASSERT_EQ(listener->session->start(listener->queue), 0);
     }
@@ -410,7 +410,7 @@ TEST_P(KernelTraceContract, NeverCompletesASessionThatIsDestroyedBefore)
     });
     complete.drain();
     settle();
-    for (Listener* listener : {&running, &ended, &complete}) {
+    for (TraceListener* listener : {&running, &ended, &complete}) {
         listener->drain();
         EXPECT_EQ(listener->completions(), 0);
     }
@@ -452,7 +452,7 @@ TEST_P(KernelTraceContract, HoldsNothingOfASessionThatIsGone)
 
 TEST_P(KernelTraceContract, RefusesAnEmptyRangeAndAnEmptyHandler)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     EXPECT_NE(listener.filter(9, 5), 0);
     EXPECT_NE(listener.session->filterEventRange(0, 99, nullptr), 0);
     ASSERT_EQ(listener.filter(20, 20), 0);
@@ -466,7 +466,7 @@ TEST_P(KernelTraceContract, RefusesAnEmptyRangeAndAnEmptyHandler)
 
 TEST_P(KernelTraceContract, SaysThatASessionHasStartedAlready)
 {
-    Listener listener(*subject);
+    TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(1, 1), 0);
     EXPECT_NE(listener.session->start(nullptr), 0) << "without a queue it has not";
     ASSERT_EQ(listener.session->start(listener.queue), 0);

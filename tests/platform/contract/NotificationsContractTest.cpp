@@ -78,9 +78,10 @@ struct Told {
 };
 
 // Registers a name and keeps the calls of its handler, which may outlive this object.
-class Listener {
+class NotificationListener {
 public:
-    Listener(NotificationsSubject& subject, const std::string& name, const std::shared_ptr<platform::WorkQueue>& queue)
+    NotificationListener(NotificationsSubject& subject, const std::string& name,
+                         const std::shared_ptr<platform::WorkQueue>& queue)
         : subject_(subject)
     {
         auto& notifications = subject.notifications();
@@ -97,12 +98,12 @@ public:
         EXPECT_NE(registration.token, 0);
         token = registration.token;
     }
-    ~Listener()
+    ~NotificationListener()
     {
         record_->progress.change([&] { record_->isClosed = true; });
     }
-    Listener(const Listener&) = delete;
-    Listener& operator=(const Listener&) = delete;
+    NotificationListener(const NotificationListener&) = delete;
+    NotificationListener& operator=(const NotificationListener&) = delete;
 
     [[nodiscard]] bool waitForMoreThan(std::size_t count)
     {
@@ -131,7 +132,7 @@ protected:
     // Returns after all earlier posts were handled, because they are handled in order.
     void settle()
     {
-        Listener fence(*subject, "fence", queue);
+        NotificationListener fence(*subject, "fence", queue);
         subject->post("fence", 0);
         ASSERT_TRUE(fence.waitForMoreThan(0));
     }
@@ -143,7 +144,7 @@ KESTO_CONTRACT(NotificationsContract, (provider<NotificationsSubject, FakeNotifi
 
 TEST_P(NotificationsContract, CallTheHandlerOnItsQueueWithItsTokenAndTheStateThatWasPosted)
 {
-    Listener ringer(*subject, "ringer", queue);
+    NotificationListener ringer(*subject, "ringer", queue);
     subject->post("ringer", 1);
     ASSERT_TRUE(ringer.waitForMoreThan(0));
     EXPECT_EQ(ringer.told()[0].token, ringer.token);
@@ -153,7 +154,7 @@ TEST_P(NotificationsContract, CallTheHandlerOnItsQueueWithItsTokenAndTheStateTha
 
 TEST_P(NotificationsContract, CallTheHandlerOnceForEachPostAlsoOfTheSameState)
 {
-    Listener ringer(*subject, "ringer", queue);
+    NotificationListener ringer(*subject, "ringer", queue);
     for (std::size_t posts = 1; posts <= 3; ++posts) {
         subject->post("ringer", 1);
         settle();
@@ -163,7 +164,7 @@ TEST_P(NotificationsContract, CallTheHandlerOnceForEachPostAlsoOfTheSameState)
 
 TEST_P(NotificationsContract, CallTheHandlerAfterTheLastOfPostsThatComeCloseTogether)
 {
-    Listener ringer(*subject, "ringer", queue);
+    NotificationListener ringer(*subject, "ringer", queue);
     for (std::uint64_t state = 1; state <= 100; ++state)
         subject->post("ringer", state);
     settle();
@@ -173,9 +174,9 @@ TEST_P(NotificationsContract, CallTheHandlerAfterTheLastOfPostsThatComeCloseToge
 
 TEST_P(NotificationsContract, CallEveryHandlerOfTheNameAndNoneOfAnother)
 {
-    Listener first(*subject, "ringer", queue);
-    Listener second(*subject, "ringer", queue);
-    Listener other(*subject, "other", queue);
+    NotificationListener first(*subject, "ringer", queue);
+    NotificationListener second(*subject, "ringer", queue);
+    NotificationListener other(*subject, "other", queue);
     EXPECT_NE(first.token, second.token);
     EXPECT_NE(first.token, other.token);
     EXPECT_NE(second.token, other.token);
@@ -192,7 +193,7 @@ TEST_P(NotificationsContract, TellNothingOfWhatWasPostedBefore)
 {
     subject->post("ringer", 1);
     settle();
-    Listener ringer(*subject, "ringer", queue);
+    NotificationListener ringer(*subject, "ringer", queue);
     settle();
     EXPECT_EQ(ringer.told().size(), 0U);
     EXPECT_EQ(subject->notifications().state(ringer.token), 1U) << "but its state is there";
@@ -200,7 +201,7 @@ TEST_P(NotificationsContract, TellNothingOfWhatWasPostedBefore)
 
 TEST_P(NotificationsContract, HaveNoStateUnlessOneWasPosted)
 {
-    Listener ringer(*subject, "ringer", queue);
+    NotificationListener ringer(*subject, "ringer", queue);
     ASSERT_FALSE(subject->notifications().state(ringer.token));
     EXPECT_NE(subject->notifications().state(ringer.token).error(), 0U);
     subject->post("ringer", std::nullopt);
@@ -210,7 +211,7 @@ TEST_P(NotificationsContract, HaveNoStateUnlessOneWasPosted)
 
 TEST_P(NotificationsContract, CarryStatesOf64Bits)
 {
-    const Listener ringer(*subject, "ringer", queue);
+    const NotificationListener ringer(*subject, "ringer", queue);
     for (const std::uint64_t state : {~std::uint64_t{0}, std::uint64_t{0}}) {
         subject->post("ringer", state);
         settle();
@@ -220,7 +221,7 @@ TEST_P(NotificationsContract, CarryStatesOf64Bits)
 
 TEST_P(NotificationsContract, HaveNoStateForAnUnknownToken)
 {
-    const Listener ringer(*subject, "ringer", queue);
+    const NotificationListener ringer(*subject, "ringer", queue);
     subject->post("ringer", 1);
     for (const std::int32_t token : {0, -1, 99}) {
         ASSERT_FALSE(subject->notifications().state(token)) << token;
@@ -234,13 +235,13 @@ TEST_P(NotificationsContract, SayThatARegistrationFailedAndGiveTokenZero)
                                                                       [](std::int32_t) { ADD_FAILURE(); });
     EXPECT_NE(failed.status, 0U);
     EXPECT_EQ(failed.token, 0);
-    const Listener other(*subject, "ringer", queue);
+    const NotificationListener other(*subject, "ringer", queue);
     EXPECT_NE(other.token, 0);
 }
 
 TEST_P(NotificationsContract, KeepTheQueueForWhatIsStillToCome)
 {
-    Listener ringer(*subject, "ringer", queue);
+    NotificationListener ringer(*subject, "ringer", queue);
     const std::weak_ptr<platform::WorkQueue> held = queue;
     queue.reset();
     EXPECT_FALSE(held.expired());

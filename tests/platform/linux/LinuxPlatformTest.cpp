@@ -2,8 +2,8 @@
 #include "platform/linux/LinuxPlatform.h"
 
 #include "platform/linux/store/StoreReader.h"
+#include "support/ProcessThreads.h"
 #include "support/TemporaryDirectory.h"
-#include "support/Threads.h"
 
 #include <future>
 #include <gtest/gtest.h>

@@ -11,9 +11,9 @@
 namespace {
 
 using libkesto::Doorbell;
-using libkesto::HistogramChannel;
-using libkesto::SimpleChannel;
-using libkesto::StateChannel;
+using libkesto::HistogramChannelValue;
+using libkesto::SimpleChannelValue;
+using libkesto::StateChannelValue;
 using std::chrono::milliseconds;
 
 class Channels : public testing::Test {
@@ -56,7 +56,7 @@ protected:
 
 TEST_F(Channels, ASimpleOneAddsAndIsSet)
 {
-    SimpleChannel channel(bell);
+    SimpleChannelValue channel(bell);
     EXPECT_EQ(textOf(channel), "simple\n0\n");
     EXPECT_EQ(channel.add(5), KESTO_OK);
     EXPECT_EQ(channel.add(-7), KESTO_OK);
@@ -67,7 +67,7 @@ TEST_F(Channels, ASimpleOneAddsAndIsSet)
 
 TEST_F(Channels, ASimpleOneLosesNothingWhenManyAddAtOnce)
 {
-    SimpleChannel channel(bell);
+    SimpleChannelValue channel(bell);
     inThreads([&](int) {
         for (int count = 0; count < 10'000; ++count)
             channel.add(1);
@@ -79,7 +79,7 @@ TEST_F(Channels, ASimpleOneLosesNothingWhenManyAddAtOnce)
 
 TEST_F(Channels, AHistogramCountsInTheBucketThatHoldsTheValue)
 {
-    HistogramChannel channel(bell, "ms", {0, 10, 20, 40});
+    HistogramChannelValue channel(bell, "ms", {0, 10, 20, 40});
     EXPECT_EQ(textOf(channel), "histogram ms\n0 0\n0 10 0\n10 20 0\n20 40 0\n");
     for (const std::int64_t value : {0, 9, 10, 19, 20, 39})
         EXPECT_EQ(channel.record(value), KESTO_OK);
@@ -88,7 +88,7 @@ TEST_F(Channels, AHistogramCountsInTheBucketThatHoldsTheValue)
 
 TEST_F(Channels, AHistogramCountsWhatLiesOutsideInItsOutermostBuckets)
 {
-    HistogramChannel channel(bell, "", {0, 10, 20});
+    HistogramChannelValue channel(bell, "", {0, 10, 20});
     for (const std::int64_t value : {INT64_MIN, std::int64_t{-1}, std::int64_t{20}, INT64_MAX})
         channel.record(value);
     EXPECT_EQ(textOf(channel), "histogram\n-9223372036854775808 9223372036854775807\n0 10 2\n10 20 2\n");
@@ -96,7 +96,7 @@ TEST_F(Channels, AHistogramCountsWhatLiesOutsideInItsOutermostBuckets)
 
 TEST_F(Channels, AHistogramMayHaveOneBucket)
 {
-    HistogramChannel channel(bell, "", {5, 6});
+    HistogramChannelValue channel(bell, "", {5, 6});
     channel.record(5);
     channel.record(100);
     EXPECT_EQ(textOf(channel), "histogram\n5 100\n5 6 2\n");
@@ -104,7 +104,7 @@ TEST_F(Channels, AHistogramMayHaveOneBucket)
 
 TEST_F(Channels, AHistogramLosesNothingWhenManyRecordAtOnce)
 {
-    HistogramChannel channel(bell, "", {0, 1, 2, 3, 4});
+    HistogramChannelValue channel(bell, "", {0, 1, 2, 3, 4});
     inThreads([&](int thread) {
         for (int count = 0; count < 10'000; ++count)
             channel.record(thread);
@@ -116,13 +116,13 @@ TEST_F(Channels, AHistogramLosesNothingWhenManyRecordAtOnce)
 
 TEST_F(Channels, AStateIsEnteredOnceAtTheBeginning)
 {
-    StateChannel channel(bell, {"Idle", "Running"}, 1, begin);
+    StateChannelValue channel(bell, {"Idle", "Running"}, 1, begin);
     EXPECT_EQ(textOf(channel), "state\nIdle 0 0 0.000000\nRunning 1 0 0.000000\n");
 }
 
 TEST_F(Channels, AStateLastsUntilAnotherIsEntered)
 {
-    StateChannel channel(bell, {"Idle", "Running"}, 0, begin);
+    StateChannelValue channel(bell, {"Idle", "Running"}, 0, begin);
     EXPECT_EQ(channel.enter(1, begin + milliseconds(120)), KESTO_OK);
     EXPECT_EQ(channel.enter(0, begin + milliseconds(1000)), KESTO_OK);
     EXPECT_EQ(textOf(channel, milliseconds(1000)), "state\nIdle 2 120 0.120000\nRunning 1 880 0.880000\n");
@@ -131,14 +131,14 @@ TEST_F(Channels, AStateLastsUntilAnotherIsEntered)
 
 TEST_F(Channels, AStateThatIsEnteredAgainGoesOn)
 {
-    StateChannel channel(bell, {"Idle", "Running"}, 0, begin);
+    StateChannelValue channel(bell, {"Idle", "Running"}, 0, begin);
     channel.enter(0, begin + milliseconds(10));
     EXPECT_EQ(textOf(channel, milliseconds(20)), "state\nIdle 1 20 1.000000\nRunning 0 0 0.000000\n");
 }
 
 TEST_F(Channels, AStateThatIsNotThereCannotBeEntered)
 {
-    StateChannel channel(bell, {"Idle", "Running"}, 0, begin);
+    StateChannelValue channel(bell, {"Idle", "Running"}, 0, begin);
     EXPECT_EQ(channel.enter(2, begin), KESTO_INVALID_ARGUMENT);
     EXPECT_EQ(channel.enter(SIZE_MAX, begin), KESTO_INVALID_ARGUMENT);
     EXPECT_EQ(textOf(channel), "state\nIdle 1 0 0.000000\nRunning 0 0 0.000000\n");
@@ -146,7 +146,7 @@ TEST_F(Channels, AStateThatIsNotThereCannotBeEntered)
 
 TEST_F(Channels, ATimeThatIsShownNeverBecomesLess)
 {
-    StateChannel channel(bell, {"Idle", "Running"}, 0, begin);
+    StateChannelValue channel(bell, {"Idle", "Running"}, 0, begin);
     EXPECT_EQ(textOf(channel, milliseconds(50)), "state\nIdle 1 50 1.000000\nRunning 0 0 0.000000\n");
     // As from a thread that read the clock before the file was written.
     channel.enter(1, begin + milliseconds(40));
@@ -155,7 +155,7 @@ TEST_F(Channels, ATimeThatIsShownNeverBecomesLess)
 
 TEST_F(Channels, StatesLoseNoTimeWhenManyEnterAtOnce)
 {
-    StateChannel channel(bell, {"0", "1", "2", "3"}, 0, begin);
+    StateChannelValue channel(bell, {"0", "1", "2", "3"}, 0, begin);
     inThreads([&](int thread) { enterManyTimes(channel, thread); });
     const auto now = std::chrono::ceil<milliseconds>(libkesto::ChannelClock::now() - begin);
     const auto after = platform::parseChannelFile(textOf(channel, now));
@@ -169,7 +169,7 @@ TEST_F(Channels, StatesLoseNoTimeWhenManyEnterAtOnce)
 // The shown times may run ahead of a thread that read the clock and enters its state late, so this does not check sums.
 TEST_F(Channels, StatesNeverGoBackWhileManyEnterAtOnce)
 {
-    StateChannel channel(bell, {"0", "1", "2", "3"}, 0, begin);
+    StateChannelValue channel(bell, {"0", "1", "2", "3"}, 0, begin);
     std::atomic<bool> isDone = false;
     std::thread reader([&] {
         std::vector<platform::StateResidency> before(4);
@@ -193,9 +193,9 @@ TEST_F(Channels, StatesNeverGoBackWhileManyEnterAtOnce)
 
 TEST_F(Channels, RefuseWhatIsOfAnotherKind)
 {
-    SimpleChannel simple(bell);
-    HistogramChannel histogram(bell, "", {0, 1});
-    StateChannel state(bell, {"On"}, 0, begin);
+    SimpleChannelValue simple(bell);
+    HistogramChannelValue histogram(bell, "", {0, 1});
+    StateChannelValue state(bell, {"On"}, 0, begin);
     EXPECT_EQ(simple.record(1), KESTO_INVALID_ARGUMENT);
     EXPECT_EQ(simple.enter(0, begin), KESTO_INVALID_ARGUMENT);
     EXPECT_EQ(histogram.add(1), KESTO_INVALID_ARGUMENT);
@@ -206,13 +206,13 @@ TEST_F(Channels, RefuseWhatIsOfAnotherKind)
 
 TEST_F(Channels, KnowWhetherTheyHaveChanged)
 {
-    SimpleChannel channel(bell);
+    SimpleChannelValue channel(bell);
     EXPECT_FALSE(channel.isChanged());
     channel.add(1);
     EXPECT_TRUE(channel.isChanged());
     channel.setChanged(false);
     EXPECT_FALSE(channel.isChanged());
-    StateChannel state(bell, {"On", "Off"}, 0, begin);
+    StateChannelValue state(bell, {"On", "Off"}, 0, begin);
     state.enter(0, begin);
     EXPECT_FALSE(state.isChanged()) << "it is in that state already";
     state.enter(1, begin);
@@ -221,7 +221,7 @@ TEST_F(Channels, KnowWhetherTheyHaveChanged)
 
 TEST_F(Channels, RingOnceWhenTheThreadIsAsleepAndElseNever)
 {
-    SimpleChannel channel(bell);
+    SimpleChannelValue channel(bell);
     channel.add(1);
     EXPECT_EQ(rings(), 0U) << "awake";
     channel.setChanged(false);
@@ -232,7 +232,7 @@ TEST_F(Channels, RingOnceWhenTheThreadIsAsleepAndElseNever)
     channel.setChanged(false);
     channel.add(1);
     EXPECT_EQ(rings(), 0U) << "it is on its way";
-    SimpleChannel other(bell);
+    SimpleChannelValue other(bell);
     bell.fallAsleep();
     other.add(1);
     EXPECT_EQ(rings(), 1U) << "any channel";
@@ -243,13 +243,13 @@ TEST_F(Channels, OfTheMostStatesAndBucketsFitInAFileThatIsRead)
     std::vector<std::int64_t> bounds;
     for (std::int64_t index = 0; index <= KESTO_MOST_BUCKETS; ++index)
         bounds.push_back(INT64_MIN + index);
-    HistogramChannel histogram(bell, std::string(KESTO_LONGEST_STATE_NAME, 'u'), bounds);
+    HistogramChannelValue histogram(bell, std::string(KESTO_LONGEST_STATE_NAME, 'u'), bounds);
     histogram.record(INT64_MIN);
     EXPECT_LE(textOf(histogram).size(), platform::largestChannelFile);
     std::vector<std::string> names;
     for (std::size_t index = 0; index < KESTO_MOST_STATES; ++index)
         names.push_back(std::string(KESTO_LONGEST_STATE_NAME - 3, 'n') + std::to_string(index));
-    StateChannel state(bell, names, 0, begin);
+    StateChannelValue state(bell, names, 0, begin);
     EXPECT_LE(textOf(state).size(), platform::largestChannelFile);
 }
 

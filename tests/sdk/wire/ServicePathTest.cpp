@@ -2,7 +2,8 @@
 // the service has as packaged.
 #include "wire/ServicePath.h"
 
-#include <cstdlib>
+#include "support/EnvironmentVariable.h"
+
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <optional>
@@ -11,51 +12,26 @@
 namespace {
 
 using libkesto::servicePaths;
+using support::EnvironmentVariable;
 using testing::ElementsAre;
-
-// Sets a variable, or unsets it, as long as it lives.
-class Variable {
-public:
-    Variable(const char* name, const char* value) : name_(name)
-    {
-        if (const char* before = std::getenv(name); before != nullptr)
-            before_ = before;
-        set(value);
-    }
-    ~Variable() { set(before_ ? before_->c_str() : nullptr); }
-    Variable(const Variable&) = delete;
-    Variable& operator=(const Variable&) = delete;
-
-private:
-    void set(const char* value)
-    {
-        if (value == nullptr)
-            ::unsetenv(name_);
-        else
-            ::setenv(name_, value, 1);
-    }
-
-    const char* name_;
-    std::optional<std::string> before_;
-};
 
 TEST(ServicePath, IsTheOneThatWasGiven)
 {
-    const Variable socket("KESTO_SOCKET", "/from/environment");
+    const EnvironmentVariable socket("KESTO_SOCKET", "/from/environment");
     EXPECT_THAT(servicePaths("/given", "").value(), ElementsAre("/given"));
 }
 
 TEST(ServicePath, ComesFromTheEnvironmentNext)
 {
-    const Variable socket("KESTO_SOCKET", "/from/environment");
-    const Variable runtime("XDG_RUNTIME_DIR", "/run/user/1000");
+    const EnvironmentVariable socket("KESTO_SOCKET", "/from/environment");
+    const EnvironmentVariable runtime("XDG_RUNTIME_DIR", "/run/user/1000");
     EXPECT_THAT(servicePaths("", "").value(), ElementsAre("/from/environment"));
 }
 
 TEST(ServicePath, IsTheUsersOwnServiceAndThenTheSystems)
 {
-    const Variable socket("KESTO_SOCKET", nullptr);
-    const Variable runtime("XDG_RUNTIME_DIR", "/run/user/1000");
+    const EnvironmentVariable socket("KESTO_SOCKET", std::nullopt);
+    const EnvironmentVariable runtime("XDG_RUNTIME_DIR", "/run/user/1000");
     EXPECT_THAT(servicePaths("", "").value(),
                 ElementsAre("/run/user/1000/kesto/com.quarn.kesto.reporting", "/run/kesto/com.quarn.kesto.reporting"));
     EXPECT_THAT(servicePaths("", "other").value(), ElementsAre("/run/user/1000/kesto/other", "/run/kesto/other"));
@@ -63,10 +39,10 @@ TEST(ServicePath, IsTheUsersOwnServiceAndThenTheSystems)
 
 TEST(ServicePath, IsTheSystemsWhereThereIsNoUsersSession)
 {
-    const Variable socket("KESTO_SOCKET", nullptr);
-    const Variable runtime("XDG_RUNTIME_DIR", nullptr);
+    const EnvironmentVariable socket("KESTO_SOCKET", std::nullopt);
+    const EnvironmentVariable runtime("XDG_RUNTIME_DIR", std::nullopt);
     EXPECT_THAT(servicePaths("", "").value(), ElementsAre("/run/kesto/com.quarn.kesto.reporting"));
-    const Variable empty("XDG_RUNTIME_DIR", "");
+    const EnvironmentVariable empty("XDG_RUNTIME_DIR", "");
     EXPECT_THAT(servicePaths("", "").value(), ElementsAre("/run/kesto/com.quarn.kesto.reporting"));
 }
 

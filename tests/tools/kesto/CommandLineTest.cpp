@@ -32,18 +32,18 @@ TEST_F(CommandLine, HelpNamesEveryVerb)
         EXPECT_THAT(tool.print({"prefs", verb, "--help"}), HasSubstr("DOMAIN"));
 }
 
-struct WrongLine {
+struct WrongArguments {
     std::string name;
     Tool::Arguments arguments;
     std::string reason;
 };
 
-void PrintTo(const WrongLine& line, std::ostream* out)
+void PrintTo(const WrongArguments& line, std::ostream* out)
 {
     *out << line.name;
 }
 
-class WrongCommandLine : public CommandLine, public testing::WithParamInterface<WrongLine> { };
+class WrongCommandLine : public CommandLine, public testing::WithParamInterface<WrongArguments> { };
 
 TEST_P(WrongCommandLine, IsReportedAndEndsWithStatus2)
 {
@@ -56,30 +56,31 @@ TEST_P(WrongCommandLine, IsReportedAndEndsWithStatus2)
 INSTANTIATE_TEST_SUITE_P(
     OfEveryKind, WrongCommandLine,
     testing::Values(
-        WrongLine{"NoVerb", {}, "subcommand is required"}, WrongLine{"AnUnknownVerb", {"play"}, "play"},
-        WrongLine{"AnUnknownOption", {"events", "--loud"}, "--loud"},
-        WrongLine{"AnOptionWithoutItsValue", {"events", "--name"}, "--name"},
-        WrongLine{"ATimeThatIsMalformed", {"events", "--since", "soon"}, "\"soon\" is not a time"},
-        WrongLine{"ANegativeCount", {"events", "--count", "-1"}, "--count"},
-        WrongLine{"ACountThatIsNotANumber", {"events", "--count", "few"}, "few"},
-        WrongLine{"ANegativeWait", {"client", "--wait", "-1"}, "--wait"},
-        WrongLine{"PrefsWithoutAVerb", {"prefs"}, "subcommand is required"},
-        WrongLine{"PrefsWithAnUnknownVerb", {"prefs", "toggle", "a", "b"}, "toggle"},
-        WrongLine{"GettingWithoutAKey", {"prefs", "get", "com.quarn.kesto"}, "KEY"},
-        WrongLine{"SettingWithoutAValue", {"prefs", "set", "com.quarn.kesto", "key"}, "VALUE"},
-        WrongLine{"SettingWithTwoValues", {"prefs", "set", "com.quarn.kesto", "key", "a", "b"}, "b"},
-        WrongLine{"ADomainThatLeadsElsewhere", {"prefs", "get", "../kesto", "key"}, "\"../kesto\" is not a domain"},
-        WrongLine{"ADomainThatIsHidden", {"prefs", "list", ".kesto"}, "\".kesto\" is not a domain"},
-        WrongLine{"NotifyingNothing", {"notify"}, "NAME"},
-        WrongLine{"ANotificationThatLeadsElsewhere", {"notify", "../name"}, "cannot be the name"},
-        WrongLine{"ANotificationThatIsHidden", {"notify", ".name"}, "cannot be the name"},
-        WrongLine{"ANotificationThatIsTooLong", {"notify", std::string(256, 'x')}, "cannot be the name"},
-        WrongLine{"AStateThatIsNotANumber", {"notify", "name", "on"}, "\"on\" is not a state"},
-        WrongLine{"AStateThatIsNegative", {"notify", "name", "-1"}, "\"-1\" is not a state"},
-        WrongLine{"AStateThatIsTooLarge", {"notify", "name", "18446744073709551616"}, "is not a state"},
-        WrongLine{"AStateThatIsHexadecimal", {"notify", "name", "0x1"}, "is not a state"},
-        WrongLine{"AStateThatIsEmpty", {"notify", "name", ""}, "is not a state"},
-        WrongLine{"NoSummary", {"summary"}, "FILE"}),
+        WrongArguments{"NoVerb", {}, "subcommand is required"}, WrongArguments{"AnUnknownVerb", {"play"}, "play"},
+        WrongArguments{"AnUnknownOption", {"events", "--loud"}, "--loud"},
+        WrongArguments{"AnOptionWithoutItsValue", {"events", "--name"}, "--name"},
+        WrongArguments{"ATimeThatIsMalformed", {"events", "--since", "soon"}, "\"soon\" is not a time"},
+        WrongArguments{"ANegativeCount", {"events", "--count", "-1"}, "--count"},
+        WrongArguments{"ACountThatIsNotANumber", {"events", "--count", "few"}, "few"},
+        WrongArguments{"ANegativeWait", {"client", "--wait", "-1"}, "--wait"},
+        WrongArguments{"PrefsWithoutAVerb", {"prefs"}, "subcommand is required"},
+        WrongArguments{"PrefsWithAnUnknownVerb", {"prefs", "toggle", "a", "b"}, "toggle"},
+        WrongArguments{"GettingWithoutAKey", {"prefs", "get", "com.quarn.kesto"}, "KEY"},
+        WrongArguments{"SettingWithoutAValue", {"prefs", "set", "com.quarn.kesto", "key"}, "VALUE"},
+        WrongArguments{"SettingWithTwoValues", {"prefs", "set", "com.quarn.kesto", "key", "a", "b"}, "b"},
+        WrongArguments{
+            "ADomainThatLeadsElsewhere", {"prefs", "get", "../kesto", "key"}, "\"../kesto\" is not a domain"},
+        WrongArguments{"ADomainThatIsHidden", {"prefs", "list", ".kesto"}, "\".kesto\" is not a domain"},
+        WrongArguments{"NotifyingNothing", {"notify"}, "NAME"},
+        WrongArguments{"ANotificationThatLeadsElsewhere", {"notify", "../name"}, "cannot be the name"},
+        WrongArguments{"ANotificationThatIsHidden", {"notify", ".name"}, "cannot be the name"},
+        WrongArguments{"ANotificationThatIsTooLong", {"notify", std::string(256, 'x')}, "cannot be the name"},
+        WrongArguments{"AStateThatIsNotANumber", {"notify", "name", "on"}, "\"on\" is not a state"},
+        WrongArguments{"AStateThatIsNegative", {"notify", "name", "-1"}, "\"-1\" is not a state"},
+        WrongArguments{"AStateThatIsTooLarge", {"notify", "name", "18446744073709551616"}, "is not a state"},
+        WrongArguments{"AStateThatIsHexadecimal", {"notify", "name", "0x1"}, "is not a state"},
+        WrongArguments{"AStateThatIsEmpty", {"notify", "name", ""}, "is not a state"},
+        WrongArguments{"NoSummary", {"summary"}, "FILE"}),
     [](const auto& line) { return line.param.name; });
 
 TEST_F(CommandLine, OutputThatCannotBeWrittenIsAFailure)

@@ -25,8 +25,8 @@ namespace {
 constexpr int longestSilence = 20'000; // milliseconds
 constexpr int exitSkip = 77; // of headless-pipewire, when programs are not installed
 
-struct Pipe {
-    Pipe()
+struct ProgramPipe {
+    ProgramPipe()
     {
         if (::pipe2(ends.data(), O_CLOEXEC) != 0)
             throw std::system_error(errno, std::generic_category(), "pipe");
@@ -60,8 +60,8 @@ std::vector<char*> pointers(std::vector<std::string>& texts)
 
 Program::Program(const std::vector<std::string>& arguments, const Environment& environment)
 {
-    const Pipe input;
-    const Pipe output;
+    const ProgramPipe input;
+    const ProgramPipe output;
     posix_spawn_file_actions_t actions;
     posix_spawn_file_actions_init(&actions);
     posix_spawn_file_actions_adddup2(&actions, input.ends[0], STDIN_FILENO);

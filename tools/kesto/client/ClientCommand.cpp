@@ -4,7 +4,7 @@
 #include "foundation/values/Json.h"
 #include "foundation/values/Value.h"
 #include "kesto/Commands.h"
-#include "kesto/client/Call.h"
+#include "kesto/client/ClientCall.h"
 
 #include <chrono>
 #include <condition_variable>
@@ -80,7 +80,7 @@ bool readLine(std::istream& input, std::string& line)
 
 // How many answers to wait for at the end: a start is answered when its session stops, which need not happen, and
 // the service type of no reporter is answered twice.
-std::size_t awaitedAnswers(const Call& call)
+std::size_t awaitedAnswers(const ClientCall& call)
 {
     if (call.operation == kesto::Operation::StartSession)
         return 0;
@@ -116,7 +116,7 @@ private:
     void carryOut(std::string_view line, unsigned number)
     {
         const auto call = line.size() > longestLine ? std::unexpected(fmt::format("longer than {} bytes", longestLine))
-                                                    : parseCall(line);
+                                                    : parseClientCall(line);
         if (!call) {
             fmt::print(stderr, "kesto client: line {}: {}\n", number, call.error());
             const std::scoped_lock lock(lock_);

@@ -2,9 +2,9 @@
 #include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
-#include "kesto/Places.h"
+#include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
-#include "kesto/results/BugCaptures.h"
+#include "kesto/results/CapturedBugs.h"
 
 #include <algorithm>
 #include <fmt/format.h>
@@ -54,12 +54,12 @@ std::string bugText(const Dictionary& signature)
                        entryText(signature, "subtypeContext"));
 }
 
-void printTable(const std::vector<BugCapture>& captures)
+void printTable(const std::vector<CapturedBug>& captures)
 {
     const std::size_t width = outputWidth();
     fmt::print("{:>{}} {} {:>{}} {} {}\n", "NUMBER", numberColumns, padded("TIME", timeColumns), "STATE", sizeColumns,
                padded("PROCESS", processColumns), "BUG");
-    for (const BugCapture& capture : captures)
+    for (const CapturedBug& capture : captures)
         fmt::print("{:>{}} {} {:>{}} {} {}\n", capture.number, numberColumns, timeText(capture.time),
                    sizeText(capture.bytes), sizeColumns,
                    padded(fitted(entryText(capture.signature, "detectedProcess"), processColumns), processColumns),
@@ -67,7 +67,7 @@ void printTable(const std::vector<BugCapture>& captures)
                           columnsBehind(numberColumns + timeColumns + sizeColumns + processColumns + 4, width)));
 }
 
-Dictionary describe(const BugCapture& capture)
+Dictionary describe(const CapturedBug& capture)
 {
     return {{"number", capture.number},
             {"time", capture.time},
@@ -121,7 +121,7 @@ void printBelow(const Value& value, std::size_t indent)
         }
 }
 
-void printWhole(const BugCapture& capture)
+void printWhole(const CapturedBug& capture)
 {
     fmt::print("bug {} of {}\n{}\n\n", capture.number, timeText(capture.time), printable(capture.directory.native()));
     printEntry("signature", capture.signature, 0);
@@ -134,9 +134,9 @@ void printWhole(const BugCapture& capture)
 
 void show(const BugsOptions& options)
 {
-    const auto captures = bugCapturesIn(options.directory);
+    const auto captures = capturedBugsIn(options.directory);
     if (options.number) {
-        const auto found = std::ranges::find(captures, *options.number, &BugCapture::number);
+        const auto found = std::ranges::find(captures, *options.number, &CapturedBug::number);
         if (found == captures.end())
             throw std::runtime_error(
                 fmt::format("bug {} does not exist in {}", *options.number, options.directory.native()));
@@ -145,7 +145,7 @@ void show(const BugsOptions& options)
         else
             printWhole(*found);
     } else if (options.isJson)
-        for (const BugCapture& capture : captures)
+        for (const CapturedBug& capture : captures)
             printJson(describe(capture));
     else if (captures.empty())
         fmt::print("No bugs were captured in {}.\n", options.directory.native());

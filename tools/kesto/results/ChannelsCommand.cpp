@@ -2,7 +2,7 @@
 #include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
-#include "kesto/Places.h"
+#include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
 #include "platform/linux/channels/ChannelDifference.h"
 #include "platform/linux/channels/ChannelTree.h"
@@ -95,9 +95,9 @@ bool hasChanged(const ReportingChannel& difference)
 
 // --- for people
 
-class Table {
+class ChannelTable {
 public:
-    explicit Table(bool hasTime) : hasTime_(hasTime) { }
+    explicit ChannelTable(bool hasTime) : hasTime_(hasTime) { }
 
     void printHead() const { printRow("TIME", {"DRIVER", "GROUP", "SUBGROUP", "CHANNEL"}, "CONTENT"); }
 
@@ -269,7 +269,7 @@ private:
     const ChannelsOptions& options_;
     const platform::ChannelTree tree_;
     const platform::SoundCards soundCards_;
-    const Table table_;
+    const ChannelTable table_;
     std::vector<platform::ChannelProblem> problems_; // of the last reading
     Lines limits_; // that it exceeded
     Lines failure_; // why it failed

@@ -2,11 +2,11 @@
 #include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
-#include "kesto/Places.h"
+#include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
 #include "kesto/files/JsonReader.h"
 #include "kesto/results/EventStore.h"
-#include "kesto/results/Moment.h"
+#include "kesto/results/MomentText.h"
 
 #include <array>
 #include <chrono>
@@ -28,7 +28,7 @@ struct EventsOptions {
     bool isFollowing = false;
 };
 
-class Table {
+class EventTable {
 public:
     void printHead() const
     {
@@ -162,7 +162,7 @@ private:
     const EventsOptions& options_;
     EventFilter filter_;
     EventStore store_;
-    Table table_;
+    EventTable table_;
 };
 
 } // namespace

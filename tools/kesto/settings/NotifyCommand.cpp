@@ -1,8 +1,8 @@
 // `kesto notify`: posts a system notification by writing its file: notifications/<name> in the runtime directory, whose
 // text is the state.
 #include "kesto/Commands.h"
-#include "kesto/Places.h"
-#include "kesto/files/Replacement.h"
+#include "kesto/ServiceDirectories.h"
+#include "kesto/files/FileReplacement.h"
 #include "platform/linux/files/FileDescriptor.h"
 
 #include <cerrno>

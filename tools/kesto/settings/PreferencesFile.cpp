@@ -2,7 +2,7 @@
 // file that the service could not read is not written.
 #include "kesto/settings/PreferencesFile.h"
 
-#include "kesto/files/Replacement.h"
+#include "kesto/files/FileReplacement.h"
 #include "kesto/settings/TomlText.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/files/SmallFile.h"
@@ -34,9 +34,10 @@ std::runtime_error failure(fmt::format_string<const Arguments&...> format, const
 }
 
 // Keeps other instances of this program from changing files of the directory.
-class Lock {
+class DirectoryLock {
 public:
-    explicit Lock(const fs::path& directory) : directory_(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC))
+    explicit DirectoryLock(const fs::path& directory)
+        : directory_(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC))
     {
         if (!directory_)
             throw failure("cannot open {}: {}", directory.native(), std::generic_category().message(errno));
@@ -74,7 +75,7 @@ void PreferencesFile::set(std::string_view key, std::string_view toml) const
 {
     makeDirectory(configurationDirectory_);
     makeDirectory(directory_);
-    const Lock lock(directory_);
+    const DirectoryLock lock(directory_);
     const std::string before = exists() ? read() : std::string();
     write(before, withTomlKey(before, key, toml));
 }
@@ -83,7 +84,7 @@ void PreferencesFile::unset(std::string_view key) const
 {
     if (!values().contains(key))
         throw noSuchKey(key);
-    const Lock lock(directory_);
+    const DirectoryLock lock(directory_);
     const std::string before = read();
     write(before, withoutTomlKey(before, key));
 }

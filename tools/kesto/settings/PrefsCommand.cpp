@@ -1,7 +1,7 @@
 // `kesto prefs`: shows and changes the preferences of the device, which the service adds to its sessions.
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
-#include "kesto/Places.h"
+#include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
 #include "kesto/settings/PreferencesFile.h"
 #include "kesto/settings/TomlText.h"

@@ -3,7 +3,7 @@
 #include "kesto/trace/TraceRecording.h"
 
 #include "kesto/Commands.h"
-#include "kesto/Places.h"
+#include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
 #include "kesto/files/OutputFile.h"
 #include "kesto/trace/TraceParametersFile.h"

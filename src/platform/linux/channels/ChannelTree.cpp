@@ -41,7 +41,7 @@ std::expected<Folder, int> openFolder(int parent, const char* name, int linkFlag
     return std::unexpected(error);
 }
 
-struct Entry {
+struct FolderEntry {
     std::string name;
     unsigned char type; // as of readdir
 };
@@ -62,7 +62,7 @@ public:
     {
         if (level == groupLevel)
             driver_ = {.folder = ::dirfd(folder)};
-        for (const Entry& entry : entriesOf(folder)) {
+        for (const FolderEntry& entry : entriesOf(folder)) {
             names_[level] = entry.name;
             if (!foundation::isValidUtf8(entry.name))
                 fail("its name is not UTF-8", level);
@@ -79,9 +79,9 @@ private:
     enum Level : std::size_t { driverLevel, groupLevel, subgroupLevel, channelLevel, levels };
 
     // Sorted, so that the result does not depend on the order in which files were made.
-    std::vector<Entry> entriesOf(DIR* folder)
+    std::vector<FolderEntry> entriesOf(DIR* folder)
     {
-        std::vector<Entry> entries;
+        std::vector<FolderEntry> entries;
         while (const dirent* entry = ::readdir(folder)) {
             if (left_.names == 0) {
                 ++reading_.leftOut.beyondNames;
@@ -91,7 +91,7 @@ private:
             if (entry->d_name[0] != '.')
                 entries.push_back({entry->d_name, entry->d_type});
         }
-        std::ranges::sort(entries, {}, &Entry::name);
+        std::ranges::sort(entries, {}, &FolderEntry::name);
         return entries;
     }
 

@@ -10,16 +10,16 @@
 namespace platform {
 namespace {
 
-struct Answer {
+struct RememberedAnswer {
     std::uint64_t version = 0;
     std::string name;
     bool isUsed = false;
 };
 
 // Where the answer about a name is, if it was not driven away by another name.
-Answer& rememberedAnswer(std::string_view name)
+RememberedAnswer& rememberedAnswer(std::string_view name)
 {
-    thread_local std::array<Answer, UsedEventNames::answersRemembered> answers;
+    thread_local std::array<RememberedAnswer, UsedEventNames::answersRemembered> answers;
     return answers[std::hash<std::string_view>()(name) % answers.size()];
 }
 
@@ -43,7 +43,7 @@ void UsedEventNames::setPatterns(std::vector<std::string> patterns)
 
 bool UsedEventNames::contains(std::string_view name)
 {
-    Answer& answer = rememberedAnswer(name);
+    RememberedAnswer& answer = rememberedAnswer(name);
     if (answer.version != version_ || answer.name != name) {
         std::string copy(name);
         const foundation::Lock lock(lock_);

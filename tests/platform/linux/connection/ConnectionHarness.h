@@ -2,8 +2,8 @@
 #pragma once
 
 #include "foundation/Mutex.h"
-#include "platform/linux/connection/ConnectionClient.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/connection/SocketClient.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "support/Progress.h"
 #include "support/TemporaryDirectory.h"

@@ -13,8 +13,8 @@ namespace {
 using foundation::Array;
 using support::answerTo;
 using support::callNumber;
-using support::Client;
 using support::ConnectionRecord;
+using support::SocketClient;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::StartsWith;
@@ -23,7 +23,7 @@ class ConnectionLimits : public support::ConnectionTest {
 protected:
     // Writes calls with so much text, numbered from 0, until the service has stopped reading them and the socket
     // is full; how many were written, but for the last one's `unfinished` rest.
-    int writeUntilNotRead(Client& client, std::size_t textLength)
+    int writeUntilNotRead(SocketClient& client, std::size_t textLength)
     {
         for (int number = 0;; ++number) {
             unfinished = callNumber(number, textLength);
@@ -43,7 +43,7 @@ TEST_F(ConnectionLimits, ASlowReaderGetsAllOfALargeAnswer)
 {
     constexpr int answers = 6;
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     for (int answer = 1; answer <= answers; ++answer)
         support::sendAtOnce(*record.connection, answerTo({answer}, 700 * 1024)); // more than a socket takes
@@ -55,9 +55,9 @@ TEST_F(ConnectionLimits, WhoDoesNotReadItsAnswersHoldsUpOnlyItself)
     constexpr std::size_t answerSize = 512 * 1024;
     constexpr int answers = static_cast<int>(LinuxConnection::manyUnsentBytes / answerSize) + 2;
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
-    Client other(path);
+    SocketClient other(path);
     ConnectionRecord& otherRecord = connected();
 
     for (int answer = 1; answer <= answers; ++answer)
@@ -82,9 +82,9 @@ TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
 {
     constexpr std::size_t answerSize = 1000 * 1024;
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
-    Client other(path);
+    SocketClient other(path);
     ConnectionRecord& otherRecord = connected();
     std::size_t sent = 0;
     while (sent <= LinuxConnection::mostUnsentBytes + 1024 * 1024) { // more than the socket takes on top
@@ -107,7 +107,7 @@ TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
 TEST_F(ConnectionLimits, AnAnswerThatNoFrameHoldsBreaksTheConnection)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     support::sendAtOnce(*record.connection, std::string(longestFrame + 1, 'x'));
     EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
@@ -119,7 +119,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheBytesOfUnansweredCallsAreTooMany)
 {
     constexpr std::size_t textLength = 10 * 1024;
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     writeUntilNotRead(client, textLength);
     const std::size_t calls = callsOf(record);
@@ -127,7 +127,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheBytesOfUnansweredCallsAreTooMany)
     EXPECT_LT(calls * textLength, LinuxConnection::mostUnansweredBytes + ConnectionHub::mostReadAtOnce + textLength);
 
     // Another client is read from, and nothing more of this one.
-    Client other(path);
+    SocketClient other(path);
     ConnectionRecord& otherRecord = connected();
     other.write(callNumber(1));
     ASSERT_TRUE(waitForHistory(otherRecord, {"call 1"}));
@@ -144,7 +144,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheBytesOfUnansweredCallsAreTooMany)
 TEST_F(ConnectionLimits, ReadingStopsWhileTheUnansweredCallsAreTooMany)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     writeUntilNotRead(client, 0);
     const std::size_t calls = callsOf(record);
@@ -160,7 +160,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheUnansweredCallsAreTooMany)
 TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAllTheSame)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     client.write(callNumber(1));
     ASSERT_TRUE(waitForCalls(record, 1));
@@ -185,7 +185,7 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDroppe
             progress.change([&] { letters.push_back(std::move(send)); });
     });
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     {
         const auto queue = queues.makeTurnQueue("server", {.mayBeHelped = true});
@@ -220,7 +220,7 @@ TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
         return {};
     };
     listen();
-    Client client(path);
+    SocketClient client(path);
     for (int number = 0; number < starts + static_cast<int>(others); ++number)
         client.write(callNumber(number, 10));
     EXPECT_TRUE(waitForCounter(answered, others));
@@ -229,7 +229,7 @@ TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
 TEST_F(ConnectionLimits, AClientThatGoesWhileItIsNotReadFromIsNoticed)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     const int written = writeUntilNotRead(client, 1000);
     client.close();
@@ -253,7 +253,7 @@ TEST_F(ConnectionLimits, CreditGivenBackFromManyThreadsIsAllThere)
         return {};
     };
     listen();
-    Client client(path);
+    SocketClient client(path);
     std::vector<std::jthread> answering;
     for (int index = 0; index < 3; ++index) {
         answering.emplace_back([&](const std::stop_token& stopped) {
@@ -303,14 +303,14 @@ TEST_F(Descriptors, ClientsWaitUntilThereIsADescriptorForThem)
 {
     KESTO_SKIP_WHERE_TYPES_ARE_CHECKED();
     listen();
-    Client first(path);
+    SocketClient first(path);
     ConnectionRecord& record = connected();
-    Client second(path);
+    SocketClient second(path);
     connected();
-    Client third(path);
+    SocketClient third(path);
     ConnectionRecord& ofThird = connected();
     limitTo(nextDescriptor() + 1);
-    Client waiting(path); // takes the last one, so that none is left to accept it with
+    SocketClient waiting(path); // takes the last one, so that none is left to accept it with
     ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
 
     // Meanwhile the others are served, and the service does not ask again and again.
@@ -332,7 +332,7 @@ TEST_F(Descriptors, ClientsAreAcceptedAfterAPauseWhenDescriptorsWereFreedElsewhe
     KESTO_SKIP_WHERE_TYPES_ARE_CHECKED();
     listen();
     limitTo(nextDescriptor() + 1);
-    Client waiting(path);
+    SocketClient waiting(path);
     ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
     ::setrlimit(RLIMIT_NOFILE, &before);
     waiting.write(callNumber(1));
@@ -347,13 +347,13 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
     limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
     listen();
     ::setrlimit(RLIMIT_NOFILE, &before);
-    std::vector<std::unique_ptr<Client>> clients;
+    std::vector<std::unique_ptr<SocketClient>> clients;
     for (std::size_t index = 0; index < mostOfOneUser; ++index) {
-        clients.push_back(std::make_unique<Client>(path));
+        clients.push_back(std::make_unique<SocketClient>(path));
         connected();
     }
     for (int attempt = 0; attempt < 3; ++attempt)
-        EXPECT_EQ(Client(path).readNumber(), std::nullopt) << "it is closed at once";
+        EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt) << "it is closed at once";
     EXPECT_EQ(listener->counters().refused, 3U);
     EXPECT_EQ(listener->counters().accepted, mostOfOneUser);
     EXPECT_THAT(
@@ -363,10 +363,10 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
     const auto last = progress.look([&] { return records.back(); });
     clients.pop_back();
     ASSERT_TRUE(waitForEnd(*last));
-    Client again(path);
+    SocketClient again(path);
     again.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
-    EXPECT_EQ(Client(path).readNumber(), std::nullopt);
+    EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt);
     EXPECT_EQ(logged().size(), 2U) << "and is said again";
 }
 
@@ -376,12 +376,12 @@ TEST_F(Descriptors, SomeAreKeptFromClients)
     limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
     listen();
     ::setrlimit(RLIMIT_NOFILE, &before); // what was allowed at the start counts
-    std::vector<std::unique_ptr<Client>> clients;
+    std::vector<std::unique_ptr<SocketClient>> clients;
     for (std::size_t index = 0; index < most; ++index) {
-        clients.push_back(std::make_unique<Client>(path));
+        clients.push_back(std::make_unique<SocketClient>(path));
         connected();
     }
-    Client waiting(path);
+    SocketClient waiting(path);
     waiting.write(callNumber(1));
     ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
     EXPECT_EQ(listener->counters().accepted, most);

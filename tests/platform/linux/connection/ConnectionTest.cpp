@@ -21,9 +21,9 @@ using foundation::Array;
 using foundation::Value;
 using support::answerTo;
 using support::callNumber;
-using support::Client;
 using support::ConnectionRecord;
 using support::framed;
+using support::SocketClient;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
@@ -40,7 +40,7 @@ class Connections : public support::ConnectionTest { };
 TEST_F(Connections, NameTheProcessAndTheUserAtTheOtherEnd)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     EXPECT_EQ(connected().connection->description(),
               "connection of process " + std::to_string(::getpid()) + " (user " + std::to_string(::getuid()) + ")");
 }
@@ -48,7 +48,7 @@ TEST_F(Connections, NameTheProcessAndTheUserAtTheOtherEnd)
 TEST_F(Connections, PutCallsTogetherThatArriveInPieces)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     for (const char byte : callNumber(1) + callNumber(2))
         client.write(std::string_view(&byte, 1));
     EXPECT_TRUE(waitForHistory(connected(), {"call 1", "call 2"}));
@@ -57,7 +57,7 @@ TEST_F(Connections, PutCallsTogetherThatArriveInPieces)
 TEST_F(Connections, TakeTheLongestFrame)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     const std::string overhead = callNumber(1, longestFrame / 2).substr(frameHeadSize);
     const std::size_t textLength = longestFrame - (overhead.size() - longestFrame / 2);
     const std::string call = callNumber(1, textLength);
@@ -69,8 +69,8 @@ TEST_F(Connections, TakeTheLongestFrame)
 TEST_F(Connections, CallAllHandlersOnOneThread)
 {
     listen();
-    Client client(path);
-    Client other(path);
+    SocketClient client(path);
+    SocketClient other(path);
     client.write(callNumber(1));
     client.close();
     other.write(callNumber(1) + "\x01");
@@ -88,7 +88,7 @@ TEST_F(Connections, CallAllHandlersOnOneThread)
 TEST_F(Connections, MayOutliveTheirListener)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(callNumber(1));
     ConnectionRecord& record = connected();
     ASSERT_TRUE(waitForCalls(record, 1));
@@ -102,7 +102,7 @@ TEST_F(Connections, MayOutliveTheirListener)
 TEST_F(Connections, DropAndCountWhatIsSentToThemWhenTheyAreOver)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     client.close();
     ASSERT_TRUE(waitForHistory(record, {"invalidated"}));
@@ -118,7 +118,7 @@ TEST_F(Connections, DiscardDescriptorsThatAClientPasses)
         return std::distance(std::filesystem::directory_iterator("/proc/self/fd"),
                              std::filesystem::directory_iterator());
     };
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     const auto before = openDescriptors();
 
@@ -158,9 +158,9 @@ TEST_F(Connections, ServeAThousandClientsAtOnce)
         return {};
     };
     listen();
-    std::vector<std::unique_ptr<Client>> clients;
+    std::vector<std::unique_ptr<SocketClient>> clients;
     for (std::size_t index = 0; index < count; ++index)
-        clients.push_back(std::make_unique<Client>(path));
+        clients.push_back(std::make_unique<SocketClient>(path));
     for (std::size_t index = 0; index < count; ++index)
         clients[index]->write(callNumber(static_cast<int>(index)) + callNumber(static_cast<int>(count + index)));
     for (std::size_t index = 0; index < count; ++index) {
@@ -184,7 +184,7 @@ class ConnectionEnds : public support::ConnectionTest { };
 TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerClosesBetweenFrames)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(callNumber(1));
     client.close();
     EXPECT_TRUE(waitForHistory(connected(), {"call 1", "invalidated"}));
@@ -195,7 +195,7 @@ TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerClosesBetweenFrames)
 TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerOnlyStopsWriting)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.stopWriting();
     EXPECT_TRUE(waitForHistory(connected(), {"invalidated"}));
     EXPECT_THAT(logged(), IsEmpty());
@@ -204,7 +204,7 @@ TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerOnlyStopsWriting)
 TEST_F(ConnectionEnds, WithAnInterruptionInsideAFrame)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     const std::string call = callNumber(2, 100);
     client.write(callNumber(1) + call.substr(0, call.size() / 2));
     client.close();
@@ -216,7 +216,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionInsideAFrame)
 TEST_F(ConnectionEnds, WithAnInterruptionInsideAHead)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write("\x05");
     client.close();
     EXPECT_TRUE(waitForHistory(connected(), {"interrupted", "invalidated"}));
@@ -227,7 +227,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionInsideAHead)
 TEST_F(ConnectionEnds, WithAnInterruptionWhenThePeerResetsIt)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(callNumber(1));
     ConnectionRecord& record = connected();
     ASSERT_TRUE(waitForCalls(record, 1));
@@ -249,11 +249,11 @@ TEST_F(ConnectionEnds, WithAnInterruptionWhenAnAnswerFindsThePeerGone)
         return {};
     };
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     support::sendAtOnce(*record.connection, answerTo({1}));
     client.waitForSomethingToRead();
-    Client other(path);
+    SocketClient other(path);
     other.write(callNumber(1));
     isHeldUp.wait(); // the connection thread, so that it cannot know before the answer does
     client.close();
@@ -292,9 +292,9 @@ class Violations : public ConnectionEnds, public testing::WithParamInterface<Bad
 TEST_P(Violations, EndThatConnectionWithOneLineAndNoOther)
 {
     listen();
-    Client bad(path);
+    SocketClient bad(path);
     ConnectionRecord& badRecord = connected();
-    Client good(path);
+    SocketClient good(path);
     ConnectionRecord& goodRecord = connected();
     good.write(callNumber(1));
     ASSERT_TRUE(waitForCalls(goodRecord, 1));
@@ -335,7 +335,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionWhenTheHandlerFindsAViolation)
         return {};
     };
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(callNumber(1) + callNumber(2) + callNumber(3));
     EXPECT_TRUE(waitForHistory(connected(), {"interrupted", "invalidated"}));
     EXPECT_THAT(handled, ElementsAre(1, 2));
@@ -376,7 +376,7 @@ protected:
 TEST_F(Turns, HoldTheirAnswersBackUntilWhatTheyStoredIsKept)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     turn([&](Turn& turn) {
         record.connection->send(turn, answerTo({1}));
@@ -390,7 +390,7 @@ TEST_F(Turns, HoldTheirAnswersBackUntilWhatTheyStoredIsKept)
 TEST_F(Turns, HoldBackNothingThatIsSentOutsideOfThem)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     turn([&](Turn& turn) {
         record.connection->send(turn, answerTo({1}));
@@ -406,10 +406,10 @@ TEST_F(Turns, SendToSeveralConnectionsInTheOrderOfEach)
 {
     constexpr int answers = 50;
     listen();
-    std::vector<std::unique_ptr<Client>> clients;
+    std::vector<std::unique_ptr<SocketClient>> clients;
     std::vector<ConnectionRecord*> connections;
     for (int index = 0; index < 5; ++index) {
-        clients.push_back(std::make_unique<Client>(path));
+        clients.push_back(std::make_unique<SocketClient>(path));
         connections.push_back(&connected());
     }
     for (int rounds = 0; rounds < 2; ++rounds) {
@@ -429,7 +429,7 @@ TEST_F(Turns, SendToSeveralConnectionsInTheOrderOfEach)
 TEST_F(Turns, SendNothingToConnectionsThatEndedMeanwhile)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     turn([&](Turn& turn) { record.connection->send(turn, answerTo({1})); });
     client.close();
@@ -450,7 +450,7 @@ TEST_F(Turns, AreHelpedWithByTheConnectionThread)
         return {};
     };
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(callNumber(1));
     ASSERT_TRUE(progress.waitFor([&] { return ended.size() == 1; }));
     ended[0]();
@@ -467,7 +467,7 @@ TEST_F(Turns, AnswersFromManyThreadsAllArrive)
     constexpr int threads = 4;
     constexpr int answers = 2000;
     listen();
-    Client client(path);
+    SocketClient client(path);
     ConnectionRecord& record = connected();
     std::vector<std::jthread> senders;
     for (int sender = 0; sender < threads; ++sender) {

@@ -28,9 +28,9 @@ bool isNote(std::string_view name)
     return name.starts_with("note-");
 }
 
-class FolderKeeper : public testing::Test {
+class FolderKeeperTest : public testing::Test {
 protected:
-    FolderKeeper() { fs::create_directories(folder); }
+    FolderKeeperTest() { fs::create_directories(folder); }
 
     // A file of that age: the higher the number, the younger it is.
     void make(const std::string& name, int number, std::size_t size = 1) const
@@ -92,7 +92,7 @@ protected:
     platform::LinuxFileSystem files{root.path(), &keeper};
 };
 
-TEST_F(FolderKeeper, LetsTheOldestGoWhenThereAreTooManyAndLeavesRoomForMore)
+TEST_F(FolderKeeperTest, LetsTheOldestGoWhenThereAreTooManyAndLeavesRoomForMore)
 {
     for (int number = 8; number >= 1; --number)
         add(number);
@@ -109,7 +109,7 @@ TEST_F(FolderKeeper, LetsTheOldestGoWhenThereAreTooManyAndLeavesRoomForMore)
                                        + ", 3 since the start: there may be 8 of 0 MiB together")));
 }
 
-TEST_F(FolderKeeper, LetsTheOldestGoWhenTheyAreTooLargeTogether)
+TEST_F(FolderKeeperTest, LetsTheOldestGoWhenTheyAreTooLargeTogether)
 {
     for (int number = 1; number <= 3; ++number)
         add(number, 300);
@@ -120,7 +120,7 @@ TEST_F(FolderKeeper, LetsTheOldestGoWhenTheyAreTooLargeTogether)
     EXPECT_THAT(names(), ElementsAre("note-2", "note-3", "note-4"));
 }
 
-TEST_F(FolderKeeper, AlwaysLeavesTheNewest)
+TEST_F(FolderKeeperTest, AlwaysLeavesTheNewest)
 {
     add(1);
     queues.runAll();
@@ -132,7 +132,7 @@ TEST_F(FolderKeeper, AlwaysLeavesTheNewest)
     EXPECT_THAT(names(), ElementsAre("note-3"));
 }
 
-TEST_F(FolderKeeper, CountsWhatWasThereBeforeTheService)
+TEST_F(FolderKeeperTest, CountsWhatWasThereBeforeTheService)
 {
     for (int number = 100; number < 200; ++number)
         make("note-" + std::to_string(number), number);
@@ -141,7 +141,7 @@ TEST_F(FolderKeeper, CountsWhatWasThereBeforeTheService)
     EXPECT_THAT(names(), ElementsAre("note-195", "note-196", "note-197", "note-198", "note-199", "note-200"));
 }
 
-TEST_F(FolderKeeper, LooksAtTheFirstFileAndThenOnlyWhenTheSumPassesALimit)
+TEST_F(FolderKeeperTest, LooksAtTheFirstFileAndThenOnlyWhenTheSumPassesALimit)
 {
     std::size_t looks = 0;
     constexpr int rounds = 10;
@@ -154,7 +154,7 @@ TEST_F(FolderKeeper, LooksAtTheFirstFileAndThenOnlyWhenTheSumPassesALimit)
     EXPECT_EQ(looks, 2U + rounds) << "one a quarter of the limit";
 }
 
-TEST_F(FolderKeeper, LooksOnceHoweverManyFilesComeMeanwhileAndForgetsNone)
+TEST_F(FolderKeeperTest, LooksOnceHoweverManyFilesComeMeanwhileAndForgetsNone)
 {
     for (int number = 1; number <= 20; ++number)
         add(number);
@@ -168,7 +168,7 @@ TEST_F(FolderKeeper, LooksOnceHoweverManyFilesComeMeanwhileAndForgetsNone)
     }
 }
 
-TEST_F(FolderKeeper, RemovesNothingButFilesOfThatShape)
+TEST_F(FolderKeeperTest, RemovesNothingButFilesOfThatShape)
 {
     make("other", 0, 5000);
     make("a-note-1", 0, 5000);
@@ -186,7 +186,7 @@ TEST_F(FolderKeeper, RemovesNothingButFilesOfThatShape)
     EXPECT_EQ(keeper.removedFiles(), 3U);
 }
 
-TEST_F(FolderKeeper, RemovesNoFilesOfOtherUsers)
+TEST_F(FolderKeeperTest, RemovesNoFilesOfOtherUsers)
 {
     constexpr uid_t nobody = 65534;
     make("note-of-another", 0);
@@ -199,7 +199,7 @@ TEST_F(FolderKeeper, RemovesNoFilesOfOtherUsers)
     EXPECT_EQ(keeper.removedFiles(), 3U);
 }
 
-TEST_F(FolderKeeper, RemovesWhatAKilledServiceHadBegunToWrite)
+TEST_F(FolderKeeperTest, RemovesWhatAKilledServiceHadBegunToWrite)
 {
     {
         auto begun = files.createAtomically(folder / "note-0");
@@ -216,7 +216,7 @@ TEST_F(FolderKeeper, RemovesWhatAKilledServiceHadBegunToWrite)
     EXPECT_THAT(names(), ElementsAre("note-3", "note-4", "note-5", "note-6", "note-7", "note-8"));
 }
 
-TEST_F(FolderKeeper, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingElse)
+TEST_F(FolderKeeperTest, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingElse)
 {
     make(".kestod-0123456789abcdef.tmp", 0, 5000);
     make(".kestod-fedcba9876543210.tmp", 1);
@@ -234,7 +234,7 @@ TEST_F(FolderKeeper, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingElse)
                            "removed 2 files from " + folder.string() + " that a killed service had not finished")));
 }
 
-TEST_F(FolderKeeper, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissing)
+TEST_F(FolderKeeperTest, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissing)
 {
     make("note-1", 0);
     files.removeUnfinished(folder);
@@ -243,7 +243,7 @@ TEST_F(FolderKeeper, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissing)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(FolderKeeper, DoesNotLookThroughALink)
+TEST_F(FolderKeeperTest, DoesNotLookThroughALink)
 {
     for (int number = 1; number <= 8; ++number)
         add(number);
@@ -260,7 +260,7 @@ TEST_F(FolderKeeper, DoesNotLookThroughALink)
     EXPECT_EQ(queues.pending(), 0U) << "not with each file that comes";
 }
 
-TEST_F(FolderKeeper, SaysOnceWhatItCannotRemove)
+TEST_F(FolderKeeperTest, SaysOnceWhatItCannotRemove)
 {
     for (int number = 1; number <= 8; ++number)
         add(number);
@@ -277,7 +277,7 @@ TEST_F(FolderKeeper, SaysOnceWhatItCannotRemove)
     EXPECT_THAT(names(), SizeIs(11));
 }
 
-TEST_F(FolderKeeper, SaysThatItCannotRemoveWhatAKilledServiceHadBegunToWrite)
+TEST_F(FolderKeeperTest, SaysThatItCannotRemoveWhatAKilledServiceHadBegunToWrite)
 {
     make(".kestod-0123456789abcdef.tmp", 0);
     EXPECT_TRUE(isTrueWithoutRightToRemove([&] {

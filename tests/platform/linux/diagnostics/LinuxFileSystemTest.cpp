@@ -21,7 +21,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::UnorderedElementsAre;
 
-class FileSystem : public testing::Test {
+class LinuxFileSystemTest : public testing::Test {
 protected:
     // The names in a folder, hidden files too.
     static std::vector<std::string> namesIn(const fs::path& path)
@@ -69,7 +69,7 @@ protected:
 
 // --- folders
 
-TEST_F(FileSystem, MakesEveryMissingFolderWithExactlyThePermissionsDespiteTheUmask)
+TEST_F(LinuxFileSystemTest, MakesEveryMissingFolderWithExactlyThePermissionsDespiteTheUmask)
 {
     for (const mode_t mask : {0U, 022U, 077U, 0777U}) {
         const mode_t before = ::umask(mask);
@@ -84,7 +84,7 @@ TEST_F(FileSystem, MakesEveryMissingFolderWithExactlyThePermissionsDespiteTheUma
     EXPECT_EQ(permissionsOf(root / "others"), 0750U);
 }
 
-TEST_F(FileSystem, LeavesFoldersThatExistAsTheyAre)
+TEST_F(LinuxFileSystemTest, LeavesFoldersThatExistAsTheyAre)
 {
     fs::create_directory(root / "Audio");
     ASSERT_EQ(::chmod((root / "Audio").c_str(), 0750), 0);
@@ -96,7 +96,7 @@ TEST_F(FileSystem, LeavesFoldersThatExistAsTheyAre)
     EXPECT_NE(permissionsOf(root), 0777U) << "the root is not the service's to open";
 }
 
-TEST_F(FileSystem, FollowsALinkToTheRootWhichIsTheAdministrators)
+TEST_F(LinuxFileSystemTest, FollowsALinkToTheRootWhichIsTheAdministrators)
 {
     fs::create_directory(root / "real");
     fs::create_directory_symlink("real", root / "link");
@@ -108,7 +108,7 @@ TEST_F(FileSystem, FollowsALinkToTheRootWhichIsTheAdministrators)
     EXPECT_TRUE(fs::exists(root / "real/Audio/a.json"));
 }
 
-TEST_F(FileSystem, TakesNoLinkForAFolder)
+TEST_F(LinuxFileSystemTest, TakesNoLinkForAFolder)
 {
     fs::create_directory(root / "elsewhere");
     fs::create_directory_symlink("elsewhere", root / "Audio");
@@ -124,14 +124,14 @@ TEST_F(FileSystem, TakesNoLinkForAFolder)
     EXPECT_THAT(namesIn(root / "elsewhere/Reporting"), IsEmpty());
 }
 
-TEST_F(FileSystem, MakesNoFolderWhereADanglingLinkStands)
+TEST_F(LinuxFileSystemTest, MakesNoFolderWhereADanglingLinkStands)
 {
     fs::create_directory_symlink("nowhere", root / "Audio");
     EXPECT_FALSE(files.createDirectories(root / "Audio", 0777));
     EXPECT_FALSE(fs::exists(root / "nowhere"));
 }
 
-TEST_F(FileSystem, SaysWhyAFolderCannotBeMade)
+TEST_F(LinuxFileSystemTest, SaysWhyAFolderCannotBeMade)
 {
     EXPECT_EQ(LinuxFileSystem(root / "gone").createDirectories(root / "gone/Audio", 0777).error(),
               std::errc::no_such_file_or_directory);
@@ -142,7 +142,7 @@ TEST_F(FileSystem, SaysWhyAFolderCannotBeMade)
     ASSERT_EQ(::chmod(root.c_str(), 0700), 0);
 }
 
-TEST_F(FileSystem, MakesItsRootAgainAsItWasWhenItWentMeanwhile)
+TEST_F(LinuxFileSystemTest, MakesItsRootAgainAsItWasWhenItWentMeanwhile)
 {
     for (const fs::path& gone : {root / "state/logs", root / "state"})
         for (const mode_t mask : {0U, 0777U}) {
@@ -162,7 +162,7 @@ TEST_F(FileSystem, MakesItsRootAgainAsItWasWhenItWentMeanwhile)
         }
 }
 
-TEST_F(FileSystem, SaysWhyItsRootCannotBeMadeAgain)
+TEST_F(LinuxFileSystemTest, SaysWhyItsRootCannotBeMadeAgain)
 {
     fs::create_directory(root / "logs");
     LinuxFileSystem logs(root / "logs");
@@ -180,7 +180,7 @@ TEST_F(FileSystem, SaysWhyItsRootCannotBeMadeAgain)
 
 // --- files
 
-TEST_F(FileSystem, LetsEverybodyReadItsFilesDespiteTheUmask)
+TEST_F(LinuxFileSystemTest, LetsEverybodyReadItsFilesDespiteTheUmask)
 {
     for (const mode_t mask : {0U, 022U, 077U, 0777U}) {
         const fs::path path = root / std::to_string(mask);
@@ -192,7 +192,7 @@ TEST_F(FileSystem, LetsEverybodyReadItsFilesDespiteTheUmask)
     }
 }
 
-TEST_F(FileSystem, TakesThePlaceOfAnEarlierFileAndLeavesItsReadersTheOldOne)
+TEST_F(LinuxFileSystemTest, TakesThePlaceOfAnEarlierFileAndLeavesItsReadersTheOldOne)
 {
     ASSERT_TRUE(write(root / "a.json", "old"));
     std::ifstream reader(root / "a.json");
@@ -203,7 +203,7 @@ TEST_F(FileSystem, TakesThePlaceOfAnEarlierFileAndLeavesItsReadersTheOldOne)
     EXPECT_EQ(support::readFile(root / "a.json"), "new");
 }
 
-TEST_F(FileSystem, ReplacesALinkInThePlaceOfAFileAndNotWhatItLeadsTo)
+TEST_F(LinuxFileSystemTest, ReplacesALinkInThePlaceOfAFileAndNotWhatItLeadsTo)
 {
     support::writeFile(root / "precious", "kept");
     fs::create_symlink("precious", root / "a.json");
@@ -213,7 +213,7 @@ TEST_F(FileSystem, ReplacesALinkInThePlaceOfAFileAndNotWhatItLeadsTo)
     EXPECT_EQ(support::readFile(root / "a.json"), "new");
 }
 
-TEST_F(FileSystem, SaysThatAFileMayNotBeWritten)
+TEST_F(LinuxFileSystemTest, SaysThatAFileMayNotBeWritten)
 {
     fs::create_directory(root / "folder");
     ASSERT_EQ(::chmod((root / "folder").c_str(), 0555), 0);
@@ -223,7 +223,7 @@ TEST_F(FileSystem, SaysThatAFileMayNotBeWritten)
     }));
 }
 
-TEST_F(FileSystem, KeepsTheOldFileWhenTheNewOneDoesNotFit)
+TEST_F(LinuxFileSystemTest, KeepsTheOldFileWhenTheNewOneDoesNotFit)
 {
     ASSERT_TRUE(write(root / "a.json", "old"));
     EXPECT_TRUE(inChild([&] {
@@ -245,7 +245,7 @@ TEST_F(FileSystem, KeepsTheOldFileWhenTheNewOneDoesNotFit)
     EXPECT_THAT(namesIn(root), ElementsAre("a.json"));
 }
 
-TEST_F(FileSystem, StaysInAFolderThatIsMovedAwayMeanwhile)
+TEST_F(LinuxFileSystemTest, StaysInAFolderThatIsMovedAwayMeanwhile)
 {
     fs::create_directory(root / "Audio");
     fs::create_directory(root / "elsewhere");
@@ -261,7 +261,7 @@ TEST_F(FileSystem, StaysInAFolderThatIsMovedAwayMeanwhile)
 
 // --- reading
 
-TEST_F(FileSystem, SaysThatAFileMayNotBeRead)
+TEST_F(LinuxFileSystemTest, SaysThatAFileMayNotBeRead)
 {
     support::writeFile(root / "secret", "text");
     ASSERT_EQ(::chmod((root / "secret").c_str(), 0), 0);
@@ -271,7 +271,7 @@ TEST_F(FileSystem, SaysThatAFileMayNotBeRead)
 }
 
 // Merely opening a device may have an effect. The kernel (inotify) reports each opening.
-TEST_F(FileSystem, DoesNotOpenWhatIsNotAFile)
+TEST_F(LinuxFileSystemTest, DoesNotOpenWhatIsNotAFile)
 {
     ASSERT_EQ(::mkfifo((root / "pipe").c_str(), 0600), 0);
     const platform::FileDescriptor watch(::inotify_init1(IN_NONBLOCK | IN_CLOEXEC));

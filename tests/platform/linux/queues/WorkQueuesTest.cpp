@@ -6,7 +6,7 @@
 #include "platform/linux/process/Thread.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/queues/SerialQueue.h"
-#include "support/Threads.h"
+#include "support/ProcessThreads.h"
 #include "support/WatchedThread.h"
 
 #include <algorithm>

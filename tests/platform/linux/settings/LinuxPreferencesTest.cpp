@@ -5,9 +5,9 @@
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "platform/linux/settings/LinuxFeatureFlags.h"
 #include "support/PrintValues.h"
+#include "support/ProcessThreads.h"
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
-#include "support/Threads.h"
 #include "support/fakes/FakeLog.h"
 
 #include <chrono>

@@ -55,22 +55,21 @@ namespace fs = std::filesystem;
 
 constexpr std::uint64_t megabyte = 1024 * 1024;
 
-struct AnalyticsEvent {
+struct PlainEvent {
     double time = 0;
     std::string name;
     Dictionary payload;
 };
 
-AnalyticsEvent event(double time, std::string name = "com.quarn.kesto.Playback.Start",
-                     Dictionary payload = {{"key", 1}})
+PlainEvent event(double time, std::string name = "com.quarn.kesto.Playback.Start", Dictionary payload = {{"key", 1}})
 {
     return {time, std::move(name), std::move(payload)};
 }
 
-std::vector<AnalyticsEvent> events(std::size_t count, std::size_t payloadSize = 300, double time = 1'800'000'000)
+std::vector<PlainEvent> events(std::size_t count, std::size_t payloadSize = 300, double time = 1'800'000'000)
 {
     const Dictionary payload{{"text", std::string(payloadSize, 'x')}};
-    return std::vector<AnalyticsEvent>(count, event(time, "com.quarn.kesto.Playback.Start", payload));
+    return std::vector<PlainEvent>(count, event(time, "com.quarn.kesto.Playback.Start", payload));
 }
 
 class EventWriterTest : public testing::Test {
@@ -84,14 +83,14 @@ protected:
         return *writer_;
     }
     void closeWriter() { writer_.reset(); }
-    static void keepIn(EventWriter& writer, const std::vector<AnalyticsEvent>& given)
+    static void keepIn(EventWriter& writer, const std::vector<PlainEvent>& given)
     {
         EventBatch batch;
         for (const auto& [time, name, payload] : given)
             batch.add(time, name, payload);
         writer.keep(batch);
     }
-    void keep(const std::vector<AnalyticsEvent>& given) { keepIn(writer(), given); }
+    void keep(const std::vector<PlainEvent>& given) { keepIn(writer(), given); }
     void maintain(bool isQuiet = true)
     {
         while (writer().tidy(isQuiet)) { }
@@ -149,7 +148,7 @@ TEST_F(EventWriterTest, NumbersOfRowsOnEverySideOfTheStatementsSize)
 {
     std::int64_t expected = 0;
     for (const std::size_t count : {1U, 15U, 16U, 17U, 31U, 32U, 33U, 100U}) {
-        std::vector<AnalyticsEvent> given;
+        std::vector<PlainEvent> given;
         for (std::size_t number = 0; number < count; ++number)
             given.push_back(event(1, "a", {{"n", number}}));
         keep(given);
@@ -385,7 +384,7 @@ TEST_F(EventWriterTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
                                   AllOf(StartsWith("analytics events cannot be kept: "),
                                         HasSubstr("another process keeps its events in the same directory; "
                                                   "give each service its own state directory")))));
-    const std::vector<AnalyticsEvent> given{event(2, "second")};
+    const std::vector<PlainEvent> given{event(2, "second")};
     keepIn(second, given);
     EXPECT_EQ(second.lostEvents(StoreError::InUse), 1U);
     closeWriter();
@@ -558,7 +557,7 @@ TEST_F(EventWriterTest, WithoutADatabaseNothingIsLeftToTidy)
 TEST_F(EventWriterTest, LossesAreToldAtOnceAndThenOnceAMinute)
 {
     const Dictionary bad{{"n", std::numeric_limits<double>::quiet_NaN()}};
-    const auto lose = [&](std::size_t count) { keep(std::vector<AnalyticsEvent>(count, event(1, "a", bad))); };
+    const auto lose = [&](std::size_t count) { keep(std::vector<PlainEvent>(count, event(1, "a", bad))); };
     const auto told = [&](std::string_view beginning) {
         return ElementsAre(Field(&LogLine::message, StartsWith(std::string(beginning))));
     };

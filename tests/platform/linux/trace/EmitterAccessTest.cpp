@@ -15,16 +15,16 @@ namespace {
 using foundation::Array;
 using foundation::Value;
 using support::callNumber;
-using support::Client;
 using support::ConnectionRecord;
 using support::framed;
+using support::SocketClient;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
 // Stands in for the marker: bytes that are written to one end come out at the other.
-class Pipe {
+class MarkerPipe {
 public:
-    Pipe()
+    MarkerPipe()
     {
         std::array<int, 2> ends{};
         EXPECT_EQ(::pipe2(ends.data(), O_NONBLOCK | O_CLOEXEC), 0);
@@ -54,7 +54,7 @@ protected:
         return result;
     }
 
-    Pipe marker;
+    MarkerPipe marker;
     EmitterAccess access;
 };
 
@@ -121,7 +121,7 @@ protected:
     };
     static std::string request(Value number) { return framed(Array{std::move(number), "trace"}); }
 
-    static Received receive(Client& client, std::size_t answers = 1)
+    static Received receive(SocketClient& client, std::size_t answers = 1)
     {
         Received received;
         FrameReader reader;
@@ -135,7 +135,7 @@ protected:
         return received;
     }
 
-    static bool receiveSome(Client& client, FrameReader& reader, std::vector<FileDescriptor>& descriptors)
+    static bool receiveSome(SocketClient& client, FrameReader& reader, std::vector<FileDescriptor>& descriptors)
     {
         static std::array<char, 64 * 1024> bytes;
         client.waitForSomethingToRead();
@@ -166,7 +166,7 @@ protected:
         beforeListening = [this] { listener->setEmitterAccess(access); };
     }
 
-    Pipe marker;
+    MarkerPipe marker;
     EmitterAccess access;
 };
 
@@ -175,7 +175,7 @@ TEST_F(EmitterAccessConnections, HandOverTheMarkerAndThePage)
     ASSERT_FALSE(access.open(marker.in.get()));
     access.setTracing(true);
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(request(7));
     const Received received = receive(client);
     EXPECT_THAT(received.numbers, ElementsAre(7));
@@ -190,7 +190,7 @@ TEST_F(EmitterAccessConnections, HandOverTheMarkerAndThePage)
 TEST_F(EmitterAccessConnections, AreAnsweredWhenTheFirstTraceStarts)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(request(7) + callNumber(8));
     ConnectionRecord& record = connected();
     ASSERT_TRUE(waitForHistory(record, {"call 8"})) << "the service's own calls go on, and see nothing of the request";
@@ -204,7 +204,7 @@ TEST_F(EmitterAccessConnections, AreAnsweredWhenTheFirstTraceStarts)
 TEST_F(EmitterAccessConnections, MayAskOnce)
 {
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(request(7) + request(8));
     EXPECT_TRUE(waitForEnd(connected()));
     EXPECT_THAT(logged(), ElementsAre(endsBecause("it asks for the trace marker twice")));
@@ -214,7 +214,7 @@ TEST_F(EmitterAccessConnections, AskWithANumber)
 {
     listen();
     for (const Value& wrong : {Value("text"), Value(-1), Value()}) {
-        Client client(path);
+        SocketClient client(path);
         client.write(request(wrong));
         EXPECT_TRUE(waitForEnd(connected()));
     }
@@ -226,7 +226,7 @@ TEST_F(EmitterAccessConnections, ThatAreOverAreNotAnswered)
 {
     listen();
     {
-        Client client(path);
+        SocketClient client(path);
         client.write(request(7) + callNumber(1));
         ASSERT_TRUE(waitForCalls(connected(), 1));
     }
@@ -247,7 +247,7 @@ TEST_F(EmitterAccessConnections, GetTheDescriptorsWithTheirFrameHoweverMuchIsAhe
         return {};
     };
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(callNumber(1) + callNumber(2) + callNumber(3));
     client.waitForSomethingToRead();
     client.write(request(4));
@@ -267,7 +267,7 @@ TEST_F(EmitterAccessConnections, OfClientsThatReadPlainlyLoseTheDescriptorsAndNo
         return {};
     };
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(request(1));
     EXPECT_EQ(client.readNumber(), 1);
     client.write(callNumber(2));
@@ -278,7 +278,7 @@ TEST_F(EmitterAccessConnections, WithoutTracingAreNeverAnswered)
 {
     beforeListening = nullptr;
     listen();
-    Client client(path);
+    SocketClient client(path);
     client.write(request(7) + callNumber(1));
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
     EXPECT_FALSE(client.hasSomethingToRead());

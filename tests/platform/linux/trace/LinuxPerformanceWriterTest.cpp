@@ -21,7 +21,7 @@ using testing::EndsWith;
 using testing::IsEmpty;
 using testing::StartsWith;
 
-class PerformanceWriter : public testing::Test {
+class LinuxPerformanceWriterTest : public testing::Test {
 protected:
     auto open() { return writer.open(path, "KestoReporting", 4); }
     [[nodiscard]] std::size_t namesInDirectory() const
@@ -37,7 +37,7 @@ protected:
     platform::LinuxPerformanceWriter writer{files, platform::ProviderLog(log)};
 };
 
-TEST_F(PerformanceWriter, WritesADocumentWithOneRecordALine)
+TEST_F(LinuxPerformanceWriterTest, WritesADocumentWithOneRecordALine)
 {
     auto file = open();
     file->write("mix", 187'250, PerformanceUnit::Nanoseconds);
@@ -53,13 +53,13 @@ TEST_F(PerformanceWriter, WritesADocumentWithOneRecordALine)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(PerformanceWriter, WritesADocumentWithoutRecordsToo)
+TEST_F(LinuxPerformanceWriterTest, WritesADocumentWithoutRecordsToo)
 {
     open().reset();
     EXPECT_EQ(readFile(path), "{\"project\":\"KestoReporting\",\"version\":4,\"records\":[\n],\"lostValues\":0}\n");
 }
 
-TEST_F(PerformanceWriter, WritesRemarksBehindTheRecords)
+TEST_F(LinuxPerformanceWriterTest, WritesRemarksBehindTheRecords)
 {
     auto file = open();
     file->remark("lostEvents", std::uint64_t{1840});
@@ -72,7 +72,7 @@ TEST_F(PerformanceWriter, WritesRemarksBehindTheRecords)
 )");
 }
 
-TEST_F(PerformanceWriter, WritesNamesAsJsonText)
+TEST_F(LinuxPerformanceWriterTest, WritesNamesAsJsonText)
 {
     auto file = open();
     file->write("", 1, PerformanceUnit::Nanoseconds);
@@ -87,7 +87,7 @@ TEST_F(PerformanceWriter, WritesNamesAsJsonText)
 )");
 }
 
-TEST_F(PerformanceWriter, WritesNullForNumbersThatJsonCannotExpress)
+TEST_F(LinuxPerformanceWriterTest, WritesNullForNumbersThatJsonCannotExpress)
 {
     auto file = open();
     file->write("a", std::numeric_limits<double>::quiet_NaN(), PerformanceUnit::Nanoseconds);
@@ -100,7 +100,7 @@ TEST_F(PerformanceWriter, WritesNullForNumbersThatJsonCannotExpress)
 )");
 }
 
-TEST_F(PerformanceWriter, WritesEveryRecordOfALargeFile)
+TEST_F(LinuxPerformanceWriterTest, WritesEveryRecordOfALargeFile)
 {
     constexpr int count = 20'000;
     auto file = open();
@@ -114,7 +114,7 @@ TEST_F(PerformanceWriter, WritesEveryRecordOfALargeFile)
     EXPECT_TRUE(readFile(path) == expected + "\n],\"lostValues\":0}\n");
 }
 
-TEST_F(PerformanceWriter, LosesRecordsThatWouldMakeTheFileTooLargeAndSaysHowMany)
+TEST_F(LinuxPerformanceWriterTest, LosesRecordsThatWouldMakeTheFileTooLargeAndSaysHowMany)
 {
     constexpr std::size_t largest = 1000;
     platform::LinuxPerformanceWriter limited(files, platform::ProviderLog(log), largest);
@@ -150,7 +150,7 @@ private:
     void* const place_;
 };
 
-TEST_F(PerformanceWriter, DoesNotReadANameThatIsLongerThanTheRoom)
+TEST_F(LinuxPerformanceWriterTest, DoesNotReadANameThatIsLongerThanTheRoom)
 {
     constexpr std::size_t largest = 1000;
     const UnreadableName name(largest);
@@ -161,7 +161,7 @@ TEST_F(PerformanceWriter, DoesNotReadANameThatIsLongerThanTheRoom)
     EXPECT_THAT(readFile(path), EndsWith("\n],\"lostValues\":1}\n"));
 }
 
-TEST_F(PerformanceWriter, DoesNotReadANameAsLongAsOneThatDidNotFitAsJsonText)
+TEST_F(LinuxPerformanceWriterTest, DoesNotReadANameAsLongAsOneThatDidNotFitAsJsonText)
 {
     constexpr std::size_t largest = 1000;
     constexpr std::size_t size = 500;
@@ -178,7 +178,7 @@ TEST_F(PerformanceWriter, DoesNotReadANameAsLongAsOneThatDidNotFitAsJsonText)
 )");
 }
 
-TEST_F(PerformanceWriter, PutsTheFileInThePlaceOfALinkAndLeavesAloneWhatItPointedTo)
+TEST_F(LinuxPerformanceWriterTest, PutsTheFileInThePlaceOfALinkAndLeavesAloneWhatItPointedTo)
 {
     const fs::path target = directory.path() / "target";
     support::writeFile(target, "precious");
@@ -188,7 +188,7 @@ TEST_F(PerformanceWriter, PutsTheFileInThePlaceOfALinkAndLeavesAloneWhatItPointe
     EXPECT_EQ(readFile(target), "precious");
 }
 
-TEST_F(PerformanceWriter, OpensNoFileWhoseDirectoryIsMissingAndSaysSo)
+TEST_F(LinuxPerformanceWriterTest, OpensNoFileWhoseDirectoryIsMissingAndSaysSo)
 {
     EXPECT_EQ(writer.open(directory.path() / "missing/results", "p", 1), nullptr);
     EXPECT_THAT(log.lines(),
@@ -198,7 +198,7 @@ TEST_F(PerformanceWriter, OpensNoFileWhoseDirectoryIsMissingAndSaysSo)
                                          "write there")));
 }
 
-TEST_F(PerformanceWriter, OpensNoFileWhereADirectoryStandsAndSaysSo)
+TEST_F(LinuxPerformanceWriterTest, OpensNoFileWhereADirectoryStandsAndSaysSo)
 {
     fs::create_directory(path);
     EXPECT_EQ(open(), nullptr);

@@ -15,17 +15,17 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Pair;
 
-struct Reading {
+struct PageReading {
     std::vector<std::pair<std::uint64_t, std::string>> records;
     std::uint64_t missed = 0;
     bool isBroken = false;
 };
 
 // Reads a copy that ends with the page, so that reading beyond it is noticed.
-Reading read(const std::string& page, const RingBufferPageFormat& format = {})
+PageReading read(const std::string& page, const RingBufferPageFormat& format = {})
 {
     const std::vector<char> copy(page.begin(), page.end());
-    Reading reading;
+    PageReading reading;
     RingBufferPageReader reader(asBytes({copy.data(), copy.size()}), format);
     while (const auto record = reader.next())
         reading.records.emplace_back(

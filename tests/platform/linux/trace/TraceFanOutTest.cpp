@@ -31,8 +31,8 @@ private:
     std::deque<WorkItem> items_;
 };
 
-struct Listener {
-    explicit Listener(std::uint64_t start, std::uint32_t firstCode = 0, std::uint32_t lastCode = UINT32_MAX)
+struct Subscriber {
+    explicit Subscriber(std::uint64_t start, std::uint32_t firstCode = 0, std::uint32_t lastCode = UINT32_MAX)
     {
         subscription->filters.push_back({firstCode, lastCode, [this](const KernelTraceEvent& event) {
                                              times.push_back(event.timestamp);
@@ -42,9 +42,9 @@ struct Listener {
         subscription->queue = queue;
         subscription->startTime = start;
     }
-    ~Listener() { queue->run(); } // its items hold the queue
-    Listener(const Listener&) = delete;
-    Listener& operator=(const Listener&) = delete;
+    ~Subscriber() { queue->run(); } // its items hold the queue
+    Subscriber(const Subscriber&) = delete;
+    Subscriber& operator=(const Subscriber&) = delete;
     void end(std::uint64_t time) const { subscription->endTime = time; }
 
     std::shared_ptr<HeldQueue> queue = std::make_shared<HeldQueue>();
@@ -64,7 +64,7 @@ std::vector<CollectedEvent> eventsAt(std::initializer_list<std::uint64_t> times,
 
 class TraceFanOutTest : public testing::Test {
 protected:
-    void add(const Listener& listener) { ASSERT_TRUE(fanOut.add(listener.subscription)); }
+    void add(const Subscriber& listener) { ASSERT_TRUE(fanOut.add(listener.subscription)); }
 
     support::FakeLog log;
     TraceFanOut fanOut{ProviderLog(log)};
@@ -72,7 +72,7 @@ protected:
 
 TEST_F(TraceFanOutTest, GivesASessionWhatIsBetweenItsStartAndItsEndBothIncluded)
 {
-    Listener listener(10);
+    Subscriber listener(10);
     add(listener);
     fanOut.deliver(eventsAt({8, 9, 10, 11}), 15, 0);
     listener.end(20);
@@ -86,7 +86,7 @@ TEST_F(TraceFanOutTest, GivesASessionWhatIsBetweenItsStartAndItsEndBothIncluded)
 
 TEST_F(TraceFanOutTest, TellsASessionAllThatIsKnownOfAnEvent)
 {
-    Listener listener(1);
+    Subscriber listener(1);
     add(listener);
     const CollectedEvent event{.timestamp = 7,
                                .threadID = 4711,
@@ -103,8 +103,8 @@ TEST_F(TraceFanOutTest, TellsASessionAllThatIsKnownOfAnEvent)
 
 TEST_F(TraceFanOutTest, TellsTheTimeOfDayToSessionsThatWantIt)
 {
-    Listener with(1);
-    Listener without(1);
+    Subscriber with(1);
+    Subscriber without(1);
     with.subscription->hasWallTimes = true;
     add(with);
     add(without);
@@ -127,7 +127,7 @@ TEST_F(TraceFanOutTest, TellsTheTimeOfDayToSessionsThatWantIt)
 
 TEST_F(TraceFanOutTest, CompletesASessionOnceNothingOfItsTimeCanComeAnyMore)
 {
-    Listener listener(10);
+    Subscriber listener(10);
     add(listener);
     EXPECT_EQ(fanOut.nextEnd(), TraceSubscription::never);
     EXPECT_TRUE(fanOut.isWanted());
@@ -145,16 +145,16 @@ TEST_F(TraceFanOutTest, CompletesASessionOnceNothingOfItsTimeCanComeAnyMore)
 
 TEST_F(TraceFanOutTest, GivesEachSessionTheCodesThatItWants)
 {
-    Listener low(1, 0, 9);
-    Listener high(1, 10, 19);
-    Listener both(1, 9, 10);
-    for (const Listener* each : {&low, &high, &both})
+    Subscriber low(1, 0, 9);
+    Subscriber high(1, 10, 19);
+    Subscriber both(1, 9, 10);
+    for (const Subscriber* each : {&low, &high, &both})
         add(*each);
     auto events = eventsAt({1}, 0);
     for (const std::uint32_t code : {9U, 10U, 19U, 20U})
         events.push_back({.timestamp = code, .emitted = {.code = code}});
     fanOut.deliver(events, 100, 0);
-    for (const Listener* each : {&low, &high, &both})
+    for (const Subscriber* each : {&low, &high, &both})
         each->queue->run();
     EXPECT_THAT(low.times, ElementsAre(1, 9));
     EXPECT_THAT(high.times, ElementsAre(10, 19));
@@ -163,7 +163,7 @@ TEST_F(TraceFanOutTest, GivesEachSessionTheCodesThatItWants)
 
 TEST_F(TraceFanOutTest, CallsEveryFilterThatAnEventFits)
 {
-    Listener listener(1, 5, 9);
+    Subscriber listener(1, 5, 9);
     listener.subscription->filters.push_back(
         {9, 12, [&](const KernelTraceEvent& event) { listener.times.push_back(1000 + event.timestamp); }});
     add(listener);
@@ -177,7 +177,7 @@ TEST_F(TraceFanOutTest, CallsEveryFilterThatAnEventFits)
 
 TEST_F(TraceFanOutTest, DeliversNothingMoreToASessionThatIsGone)
 {
-    Listener listener(1);
+    Subscriber listener(1);
     add(listener);
     fanOut.deliver(eventsAt({1}), 10, 0);
     listener.end(11);
@@ -190,8 +190,8 @@ TEST_F(TraceFanOutTest, DeliversNothingMoreToASessionThatIsGone)
 
 TEST_F(TraceFanOutTest, ForgetsASessionThatIsRemoved)
 {
-    Listener listener(1);
-    Listener other(1);
+    Subscriber listener(1);
+    Subscriber other(1);
     add(listener);
     add(other);
     fanOut.remove(*listener.subscription);
@@ -204,7 +204,7 @@ TEST_F(TraceFanOutTest, ForgetsASessionThatIsRemoved)
 
 TEST_F(TraceFanOutTest, MayLoseASessionToItsOwnCompletion)
 {
-    Listener listener(1);
+    Subscriber listener(1);
     auto subscription = std::move(listener.subscription);
     std::weak_ptr<TraceSubscription> gone = subscription;
     bool isCompleted = false;
@@ -222,8 +222,8 @@ TEST_F(TraceFanOutTest, MayLoseASessionToItsOwnCompletion)
 
 TEST_F(TraceFanOutTest, SaysHowManyEventsASessionMayHaveLost)
 {
-    Listener before(1);
-    Listener during(1'000'000'000);
+    Subscriber before(1);
+    Subscriber during(1'000'000'000);
     add(before);
     before.end(5);
     fanOut.deliver({}, 10, 0);
@@ -239,8 +239,8 @@ TEST_F(TraceFanOutTest, SaysHowManyEventsASessionMayHaveLost)
 
 TEST_F(TraceFanOutTest, LosesWhatAQueueIsTooFarBehindWith)
 {
-    Listener listener(1);
-    Listener other(1);
+    Subscriber listener(1);
+    Subscriber other(1);
     add(listener);
     std::vector<CollectedEvent> events(TraceFanOut::mostOnTheirWay - 1, {.timestamp = 1});
     fanOut.deliver(events, 1, 0);
@@ -270,9 +270,9 @@ TEST_F(TraceFanOutTest, GivesAnySessionsWhatIsTheirs)
     rc::check([this](std::vector<std::uint8_t> times, const std::vector<std::tuple<std::uint8_t, std::uint8_t>>& spans,
                      const std::vector<std::uint8_t>& readings) {
         std::ranges::sort(times);
-        std::deque<Listener> listeners;
+        std::deque<Subscriber> listeners;
         for (const auto& [start, length] : spans) {
-            const Listener& listener = listeners.emplace_back(start, start % 3, 3);
+            const Subscriber& listener = listeners.emplace_back(start, start % 3, 3);
             listener.end(std::uint64_t{start} + length);
             RC_ASSERT(fanOut.add(listener.subscription));
         }
@@ -286,7 +286,7 @@ TEST_F(TraceFanOutTest, GivesAnySessionsWhatIsTheirs)
                 events.push_back({.timestamp = times[done], .emitted = {.code = times[done] % 4U}});
             fanOut.deliver(events, cut, 0);
         }
-        for (const Listener& listener : listeners) {
+        for (const Subscriber& listener : listeners) {
             listener.queue->run();
             std::vector<std::uint64_t> expected;
             for (const std::uint64_t time : times)

@@ -5,7 +5,7 @@
 #include "platform/linux/trace/DeliveredEvents.h"
 #include "platform/linux/trace/ImitatedTracefs.h"
 #include "platform/linux/trace/RealTracefs.h"
-#include "support/Threads.h"
+#include "support/ProcessThreads.h"
 #include "support/fakes/FakeLog.h"
 
 #include <algorithm>
@@ -52,9 +52,9 @@ std::int64_t timeOfDay(const KernelTraceEvent& event)
 constexpr std::int64_t clockTolerance = 500'000; // the two clocks are not read at the same moment
 
 // A session and its delivered events.
-class Listener {
+class SessionListener {
 public:
-    explicit Listener(TracefsKernelTrace& trace, bool hasWallTimes = true) : session(trace.createTraceSession())
+    explicit SessionListener(TracefsKernelTrace& trace, bool hasWallTimes = true) : session(trace.createTraceSession())
     {
         if (!session)
             throw std::runtime_error("the trace is not available");
@@ -123,14 +123,14 @@ TEST_F(TracefsKernelTraceTest, TouchesNothingBeforeThereIsASession)
 
 TEST_F(TracefsKernelTraceTest, IsOnWhileASessionRunsAndOffOtherwise)
 {
-    Listener listener(trace);
+    SessionListener listener(trace);
     EXPECT_EQ(tree.content("tracing_on"), "0");
     ASSERT_EQ(listener.start(), 0);
     EXPECT_EQ(tree.content("tracing_on"), "1");
     listener.end();
     EXPECT_TRUE(listener.waitForCompletion());
     EXPECT_TRUE(waitUntilOff());
-    Listener again(trace);
+    SessionListener again(trace);
     ASSERT_EQ(again.start(), 0);
     EXPECT_EQ(tree.content("tracing_on"), "1");
     EXPECT_EQ(tree.content("buffer_size_kb"), "8192");
@@ -145,14 +145,14 @@ TEST_F(TracefsKernelTraceTest, ReadsWithThePriorityOfWhatSomebodyWaitsFor)
     if (::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), own - 1) != 0)
         GTEST_SKIP() << "this process may not raise priorities";
     ::setpriority(PRIO_PROCESS, static_cast<id_t>(::gettid()), own);
-    Listener listener(trace);
+    SessionListener listener(trace);
     ASSERT_EQ(listener.start(), 0);
     EXPECT_EQ(support::nicenessBeyondOwn("kesto.trace"), -10);
 }
 
 TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
 {
-    Listener listener(trace);
+    SessionListener listener(trace);
     ASSERT_EQ(listener.start(), 0);
     const std::int64_t day = timeOfDay();
     const std::uint64_t time = now();
@@ -177,7 +177,7 @@ TEST_F(TracefsKernelTraceTest, DeliversWhatComesWhileASessionRuns)
 
 TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
 {
-    Listener listener(trace);
+    SessionListener listener(trace);
     ASSERT_EQ(listener.start(), 0);
     tree.put(0, RingBufferPageBuilder(1000).event(now(), firstCode).missed(1840).page());
     ASSERT_TRUE(listener.waitForEvents(1));
@@ -185,7 +185,7 @@ TEST_F(TracefsKernelTraceTest, TellsASessionThatIsCompleteHowManyEventsWereLost)
     ASSERT_TRUE(listener.waitForCompletion());
     EXPECT_EQ(listener.session->lostEvents(), 1840U);
 
-    Listener next(trace);
+    SessionListener next(trace);
     ASSERT_EQ(next.start(), 0);
     next.end();
     ASSERT_TRUE(next.waitForCompletion());
@@ -196,14 +196,14 @@ TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherATraceRuns)
 {
     std::optional<EmitterDescriptors> handedOut;
     access.ask(this, [&](const EmitterDescriptors& descriptors) { handedOut = descriptors; });
-    Listener one(trace);
+    SessionListener one(trace);
     ASSERT_TRUE(handedOut) << "when the first session is made";
     const auto flag = [&] {
         std::uint32_t value = 7;
         EXPECT_EQ(::pread(handedOut->page, &value, sizeof value, 0), 4);
         return value;
     };
-    Listener two(trace);
+    SessionListener two(trace);
     EXPECT_EQ(flag(), 0U);
     ASSERT_EQ(one.start(), 0);
     ASSERT_EQ(two.start(), 0);
@@ -223,7 +223,7 @@ TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherATraceRuns)
 
 TEST_F(TracefsKernelTraceTest, CompletesASessionThatCouldNotBeStarted)
 {
-    Listener listener(trace);
+    SessionListener listener(trace);
     fs::remove(tree.instance / "tracing_on");
     EXPECT_EQ(listener.start(), ENOENT);
     EXPECT_THAT(log.lines(),
@@ -235,10 +235,10 @@ TEST_F(TracefsKernelTraceTest, CompletesASessionThatCouldNotBeStarted)
 
 TEST_F(TracefsKernelTraceTest, RunsNoMoreSessionsThanItMay)
 {
-    std::deque<Listener> listeners;
+    std::deque<SessionListener> listeners;
     for (std::size_t count = 0; count < TraceFanOut::mostSessions; ++count)
         ASSERT_EQ(listeners.emplace_back(trace).start(), 0);
-    Listener extra(trace);
+    SessionListener extra(trace);
     EXPECT_EQ(extra.start(), EMFILE);
     extra.end();
     EXPECT_TRUE(extra.waitForCompletion());
@@ -361,7 +361,7 @@ protected:
 
 TEST_F(RealTraceTest, DeliversTheEventsOfThisProcessWithTheirTimes)
 {
-    Listener listener(*trace);
+    SessionListener listener(*trace);
     const EmittedEvent early{.code = firstCode};
     EXPECT_LT(::write(marker, &early, sizeof early), 0) << "the kernel takes no events while no trace runs";
     ASSERT_EQ(listener.start(), 0);
@@ -393,7 +393,7 @@ TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
     constexpr std::size_t sessions = 40;
     constexpr std::size_t step = 300; // events between two starts
     constexpr std::size_t length = 3000; // events from a session's start to its end
-    std::deque<Listener> listeners;
+    std::deque<SessionListener> listeners;
     for (std::size_t index = 0; index < sessions; ++index)
         listeners.emplace_back(*trace);
 
@@ -453,7 +453,7 @@ TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
         ::waitpid(child, nullptr, 0);
     ASSERT_EQ(ended, sessions);
 
-    for (Listener& listener : listeners) {
+    for (SessionListener& listener : listeners) {
         ASSERT_TRUE(listener.waitForCompletion());
         const auto events = listener.events();
         EXPECT_TRUE(std::ranges::is_sorted(events, {}, &KernelTraceEvent::timestamp));
@@ -491,7 +491,7 @@ TEST_F(RealTraceTest, GivesEverySessionAllOfItsTimeFromEveryProcess)
 
 TEST_F(RealTraceTest, LeavesOutWhatOthersWriteToTheMarker)
 {
-    Listener listener(*trace);
+    SessionListener listener(*trace);
     ASSERT_EQ(listener.start(), 0);
     const std::string noise(3000, 'K');
     for (const std::size_t size : {4U, 39U, 41U, 40U, 3000U})
@@ -553,7 +553,7 @@ TEST_F(RealTraceTest, TakesOverWhatAKilledServiceLeftBehind)
     }
     ::kill(child, SIGKILL);
     ::waitpid(child, nullptr, 0);
-    Listener listener(*trace);
+    SessionListener listener(*trace);
     ASSERT_EQ(listener.start(), 0);
     ownEmitter.emit(firstCode + 1, {});
     listener.end();
@@ -568,8 +568,8 @@ TEST_F(RealTraceTest, HasAnInstanceForEachServiceOnTheMachine)
     EmitterAccess otherAccess;
     TracefsKernelTrace other({.mounts = tracefs.mounts(), .instanceName = tracefs.instanceName}, otherEmitter,
                              otherAccess, ProviderLog(log));
-    Listener one(*trace);
-    Listener two(other);
+    SessionListener one(*trace);
+    SessionListener two(other);
     ASSERT_EQ(one.start(), 0);
     ASSERT_EQ(two.start(), 0);
     ownEmitter.emit(firstCode + 1, {});

@@ -166,23 +166,23 @@ TEST_F(ListeningClientCommand, ReadsAMillionBytesInALineAndALastLineWithoutItsEn
     EXPECT_THAT(answers("\r\n  \n[\"send\", {\"large\": \"" + large + "\"}, 4, 1, null]"),
                 ElementsAre(answer(1, "sendMessage", "[]")));
     EXPECT_THAT(kestod.events("com.quarn.kesto.Playback.Start"),
-                ElementsAre(Field(&end_to_end::StoredEvent::payload, StartsWith("{\"large\":\"" + large))));
+                ElementsAre(Field(&end_to_end::StoreRow::payload, StartsWith("{\"large\":\"" + large))));
 }
 
 // --- wrong lines
 
-struct WrongLine {
+struct WrongCall {
     std::string name;
     std::string line;
     std::string reason;
 };
 
-void PrintTo(const WrongLine& line, std::ostream* out)
+void PrintTo(const WrongCall& line, std::ostream* out)
 {
     *out << line.name;
 }
 
-class WrongClientLine : public ListeningClientCommand, public testing::WithParamInterface<WrongLine> { };
+class WrongClientLine : public ListeningClientCommand, public testing::WithParamInterface<WrongCall> { };
 
 TEST_P(WrongClientLine, IsToldWithItsNumberAndTheOthersAreCarriedOut)
 {
@@ -198,31 +198,31 @@ TEST_P(WrongClientLine, IsToldWithItsNumberAndTheOthersAreCarriedOut)
 INSTANTIATE_TEST_SUITE_P(
     OfEveryKind, WrongClientLine,
     testing::Values(
-        WrongLine{"NoJson", "create 1", "not JSON: Invalid value. (at character 1)"},
-        WrongLine{"HalfALine", "[\"create\", 1", "not JSON"},
-        WrongLine{"TwoCalls", "[\"kill\"] [\"kill\"]", "not JSON"}, WrongLine{"NotUtf8", "[\"\xFF\"]", "not JSON"},
-        WrongLine{"NoArray", "{\"create\": 1}", "a call is an array"},
-        WrongLine{"AnEmptyArray", "[]", "a call is an array"}, WrongLine{"NoOperation", "[1, 1]", "a call is an array"},
-        WrongLine{"AnUnknownOperation", "[\"play\", 1]", "unknown operation \"play\"; there are create"},
-        WrongLine{"TooFewArguments", "[\"create\"]", "create takes 1 arguments, not 0"},
-        WrongLine{"TooManyArguments", "[\"getAllReporters\", 1]", "getAllReporters takes 0 arguments, not 1"},
-        WrongLine{"AReporterThatIsText", "[\"create\", \"1\"]", "argument 1 of create is not a reporter ID"},
-        WrongLine{"AReporterThatIsAFraction", "[\"start\", 1.5]", "argument 1 of start is not a reporter ID"},
-        WrongLine{"AReporterThatIsTooLarge", "[\"stop\", 9223372036854775808]",
+        WrongCall{"NoJson", "create 1", "not JSON: Invalid value. (at character 1)"},
+        WrongCall{"HalfALine", "[\"create\", 1", "not JSON"},
+        WrongCall{"TwoCalls", "[\"kill\"] [\"kill\"]", "not JSON"}, WrongCall{"NotUtf8", "[\"\xFF\"]", "not JSON"},
+        WrongCall{"NoArray", "{\"create\": 1}", "a call is an array"},
+        WrongCall{"AnEmptyArray", "[]", "a call is an array"}, WrongCall{"NoOperation", "[1, 1]", "a call is an array"},
+        WrongCall{"AnUnknownOperation", "[\"play\", 1]", "unknown operation \"play\"; there are create"},
+        WrongCall{"TooFewArguments", "[\"create\"]", "create takes 1 arguments, not 0"},
+        WrongCall{"TooManyArguments", "[\"getAllReporters\", 1]", "getAllReporters takes 0 arguments, not 1"},
+        WrongCall{"AReporterThatIsText", "[\"create\", \"1\"]", "argument 1 of create is not a reporter ID"},
+        WrongCall{"AReporterThatIsAFraction", "[\"start\", 1.5]", "argument 1 of start is not a reporter ID"},
+        WrongCall{"AReporterThatIsTooLarge", "[\"stop\", 9223372036854775808]",
                   "argument 1 of stop is not a reporter ID"},
-        WrongLine{"AnUnknownServiceType", "[\"setServiceType\", \"jazz\", 1]", "argument 1 of setServiceType"},
-        WrongLine{"AServiceTypeThatIsTooLarge", "[\"setServiceType\", 65536, 1]", "argument 1 of setServiceType"},
-        WrongLine{"AnUnknownCategory", "[\"send\", {}, \"Jazz\", 1, null]", "argument 2 of send is not a category"},
-        WrongLine{"ANegativeCategory", "[\"send\", {}, -1, 1, null]", "argument 2 of send is not a category"},
-        WrongLine{"AnUnknownType", "[\"send\", {}, 4, \"Begin\", null]", "argument 3 of send is not an event type"},
-        WrongLine{"AMessageThatIsNone", "[\"send\", [], 4, 1, null]", "argument 1 of send is not a message"},
-        WrongLine{"AMessageThatIsTooDeep",
+        WrongCall{"AnUnknownServiceType", "[\"setServiceType\", \"jazz\", 1]", "argument 1 of setServiceType"},
+        WrongCall{"AServiceTypeThatIsTooLarge", "[\"setServiceType\", 65536, 1]", "argument 1 of setServiceType"},
+        WrongCall{"AnUnknownCategory", "[\"send\", {}, \"Jazz\", 1, null]", "argument 2 of send is not a category"},
+        WrongCall{"ANegativeCategory", "[\"send\", {}, -1, 1, null]", "argument 2 of send is not a category"},
+        WrongCall{"AnUnknownType", "[\"send\", {}, 4, \"Begin\", null]", "argument 3 of send is not an event type"},
+        WrongCall{"AMessageThatIsNone", "[\"send\", [], 4, 1, null]", "argument 1 of send is not a message"},
+        WrongCall{"AMessageThatIsTooDeep",
                   "[\"send\", {\"a\": " + std::string(40, '[') + std::string(40, ']') + "}, 4, 1, null]",
                   "argument 1 of send is not a message"},
-        WrongLine{"AConfigurationThatIsNone", "[\"setConfiguration\", null, 1]", "argument 1 of setConfiguration"},
-        WrongLine{"AListOfReportersThatIsNone", "[\"send\", {}, 4, 1, 1]", "argument 4 of send is not a list"},
-        WrongLine{"AReporterInTheListThatIsText", "[\"send\", {}, 4, 1, [\"1\"]]", "argument 4 of send is not a list"},
-        WrongLine{"ALineThatNeverEnds", std::string(9 * 1024 * 1024, ' ') + "[\"kill\"]", "longer than 8388608 bytes"}),
+        WrongCall{"AConfigurationThatIsNone", "[\"setConfiguration\", null, 1]", "argument 1 of setConfiguration"},
+        WrongCall{"AListOfReportersThatIsNone", "[\"send\", {}, 4, 1, 1]", "argument 4 of send is not a list"},
+        WrongCall{"AReporterInTheListThatIsText", "[\"send\", {}, 4, 1, [\"1\"]]", "argument 4 of send is not a list"},
+        WrongCall{"ALineThatNeverEnds", std::string(9 * 1024 * 1024, ' ') + "[\"kill\"]", "longer than 8388608 bytes"}),
     [](const auto& line) { return line.param.name; });
 
 // --- failures of the connection

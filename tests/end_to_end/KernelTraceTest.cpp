@@ -111,7 +111,7 @@ void expectWithin(const std::vector<double>& values, const std::vector<Bounds>& 
     }
 }
 
-class TraceTest : public testing::Test {
+class KernelTraceTest : public testing::Test {
 protected:
     void SetUp() override
     {
@@ -182,7 +182,7 @@ protected:
     std::uint64_t startCall = 0;
 };
 
-TEST_F(TraceTest, MeasuresWhatAClientEmitsFromSeveralThreads)
+TEST_F(KernelTraceTest, MeasuresWhatAClientEmitsFromSeveralThreads)
 {
     kesto::Client client;
     ASSERT_TRUE(openForTracing(client));
@@ -225,7 +225,7 @@ TEST_F(TraceTest, MeasuresWhatAClientEmitsFromSeveralThreads)
     EXPECT_EQ(kestod.countInLog("DISCARDED"), 0U);
 }
 
-TEST_F(TraceTest, MeasuresNothingThatWasEmittedBeforeItsStartOrAfterItsEnd)
+TEST_F(KernelTraceTest, MeasuresNothingThatWasEmittedBeforeItsStartOrAfterItsEnd)
 {
     kesto::Client client;
     ASSERT_TRUE(openForTracing(client));
@@ -251,7 +251,7 @@ TEST_F(TraceTest, MeasuresNothingThatWasEmittedBeforeItsStartOrAfterItsEnd)
     EXPECT_THAT(results("shared"), SizeIs(1));
 }
 
-TEST_F(TraceTest, EndsTheServiceWithStatusOneWhenItsResultsCannotBeWritten)
+TEST_F(KernelTraceTest, EndsTheServiceWithStatusOneWhenItsResultsCannotBeWritten)
 {
     if (!startSession()) {
         ASSERT_NE(missing(), "");
@@ -264,7 +264,7 @@ TEST_F(TraceTest, EndsTheServiceWithStatusOneWhenItsResultsCannotBeWritten)
     EXPECT_TRUE(kestod.log().ends_with("Failed to open quilldat writer\n")) << "nothing is said after it";
 }
 
-TEST_F(TraceTest, MeasuresAgainWhenTheServiceWasKilledDuringATrace)
+TEST_F(KernelTraceTest, MeasuresAgainWhenTheServiceWasKilledDuringATrace)
 {
     kesto::Client client;
     kesto::Options options;

@@ -1,5 +1,5 @@
 // One rule for all three directories; they differ in their names only.
-#include "kesto/Places.h"
+#include "kesto/ServiceDirectories.h"
 
 #include "platform/linux/process/Environment.h"
 

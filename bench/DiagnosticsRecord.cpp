@@ -97,7 +97,7 @@ double costOfPeersDecoding(const std::string& bytes)
 
 } // namespace
 
-void measureRecord(const Options& options, Report& report)
+void measureDiagnosticsRecord(const BenchOptions& options, Report& report)
 {
     const std::string bytes = encoded(sampleRecord<trelmmetrics::AudioIssueDetected>());
     if (bytes != sampleRecord<peer::AudioIssueDetected>().SerializeAsString())
@@ -107,7 +107,7 @@ void measureRecord(const Options& options, Report& report)
         [&] { return costOfDecoding(bytes); }, [&] { return costOfPeersDecoding(bytes); });
     const auto add = [&](std::string_view what, std::size_t place) {
         report.add({fmt::format("{} a diagnostics record, {} B", what, bytes.size()), "ns", costs[place],
-                    Peer{"libprotobuf, generated class", costs[place + 1]}, Target::ratioAtMost(1)});
+                    PeerFigure{"libprotobuf, generated class", costs[place + 1]}, Target::ratioAtMost(1)});
     };
     add("encoding", 0);
     add("encoding, to new bytes,", 2);

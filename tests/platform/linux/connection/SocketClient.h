@@ -53,9 +53,9 @@ inline void sendAtOnce(platform::Connection& connection, std::string frame)
         send();
 }
 
-class Client {
+class SocketClient {
 public:
-    explicit Client(const std::filesystem::path& path) : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0))
+    explicit SocketClient(const std::filesystem::path& path) : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0))
     {
         sockaddr_un address = {};
         address.sun_family = AF_UNIX;

@@ -1,5 +1,5 @@
 // Moments as people write them.
-#include "kesto/results/Moment.h"
+#include "kesto/results/MomentText.h"
 
 #include <chrono>
 #include <cstdlib>

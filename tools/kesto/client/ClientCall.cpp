@@ -1,9 +1,9 @@
 // The table of the operations says which arguments each takes, in order; the arguments are read one by one, and the
 // first that does not fit ends it. A table of the tool's own adds how a person names an operation and what it calls.
-#include "kesto/client/Call.h"
+#include "kesto/client/ClientCall.h"
 
 #include "client/ServiceOperations.h"
-#include "kesto/Names.h"
+#include "kesto/MessageKindNames.h"
 
 #include <array>
 #include <fmt/format.h>
@@ -20,31 +20,31 @@ using Argument = client::OperationArgument;
 using ReporterOperation = kesto::Status (kesto::Client::*)(kesto::ReporterID reporter, kesto::AnswerCallback answered);
 
 template <ReporterOperation operation>
-kesto::Status submitReporter(kesto::Client& client, const Call& call, kesto::AnswerCallback answered)
+kesto::Status submitReporter(kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered)
 {
     return (client.*operation)(call.reporter, std::move(answered));
 }
 
 struct Form {
     std::string_view shortName;
-    kesto::Status (*submit)(kesto::Client& client, const Call& call, kesto::AnswerCallback answered);
+    kesto::Status (*submit)(kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered);
 };
 
 // In the order of `client::serviceOperations`.
 constexpr auto forms = std::to_array<Form>({
     {"create", submitReporter<&kesto::Client::createSession>},
     {"setServiceType",
-     [](kesto::Client& client, const Call& call, kesto::AnswerCallback answered) {
+     [](kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered) {
          return client.setServiceType(call.serviceType, call.reporter, std::move(answered));
      }},
     {"getServiceName", submitReporter<&kesto::Client::getServiceType>},
     {"setConfiguration",
-     [](kesto::Client& client, const Call& call, kesto::AnswerCallback answered) {
+     [](kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered) {
          return client.setConfiguration(call.message, call.reporter, std::move(answered));
      }},
     {"start", submitReporter<&kesto::Client::startSession>},
     {"send",
-     [](kesto::Client& client, const Call& call, kesto::AnswerCallback answered) {
+     [](kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered) {
          const auto to = call.reporters ? kesto::Reporters(*call.reporters) : kesto::Reporters::allStarted();
          return client.send(call.message, call.category, call.type, to, std::move(answered));
      }},
@@ -52,11 +52,11 @@ constexpr auto forms = std::to_array<Form>({
     {"destroy", submitReporter<&kesto::Client::destroySession>},
     {"validate", submitReporter<&kesto::Client::validate>},
     {"getAllReporters",
-     [](kesto::Client& client, const Call&, kesto::AnswerCallback answered) {
+     [](kesto::Client& client, const ClientCall&, kesto::AnswerCallback answered) {
          return client.getAllReporters(std::move(answered));
      }},
     {"kill",
-     [](kesto::Client& client, const Call&, kesto::AnswerCallback answered) {
+     [](kesto::Client& client, const ClientCall&, kesto::AnswerCallback answered) {
          return client.killService(std::move(answered));
      }},
 });
@@ -145,7 +145,7 @@ bool readReporters(const Json& json, std::optional<std::vector<kesto::ReporterID
     return true;
 }
 
-bool read(Argument argument, const Json& json, Call& call)
+bool read(Argument argument, const Json& json, ClientCall& call)
 {
     switch (argument) {
     case Argument::ReporterID:
@@ -199,12 +199,12 @@ std::string shortNames()
 
 } // namespace
 
-kesto::Status submit(kesto::Client& client, const Call& call, kesto::AnswerCallback answered)
+kesto::Status submit(kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered)
 {
     return forms[static_cast<std::size_t>(call.operation) - 1].submit(client, call, std::move(answered));
 }
 
-std::expected<Call, std::string> parseCall(std::string_view line)
+std::expected<ClientCall, std::string> parseClientCall(std::string_view line)
 {
     rapidjson::Document document;
     document.Parse<rapidjson::kParseIterativeFlag | rapidjson::kParseValidateEncodingFlag
@@ -225,7 +225,7 @@ std::expected<Call, std::string> parseCall(std::string_view line)
     if (document.Size() - 1 != arguments.size())
         return std::unexpected(
             fmt::format("{} takes {} arguments, not {}", name, arguments.size(), document.Size() - 1));
-    Call call;
+    ClientCall call;
     call.operation = static_cast<kesto::Operation>(*place + 1);
     for (rapidjson::SizeType index = 0; index < arguments.size(); ++index)
         if (!read(arguments[index], document[index + 1], call))

@@ -6,6 +6,7 @@
 #include "support/ChildProcess.h"
 #include "support/ExchangedProviders.h"
 #include "support/InProcessPlatform.h"
+#include "support/TemporaryDirectory.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"
 
@@ -92,7 +93,7 @@ double pairingRate(const platform::KernelTraceSession& session, const std::vecto
     return static_cast<double>(events.size()) * 1e3 / cost;
 }
 
-void measurePairing(const Options& options, Report& report)
+void measurePairing(const BenchOptions& options, Report& report)
 {
     constexpr std::size_t count = 1'000'000;
     RecordedTrace trace({});
@@ -138,10 +139,10 @@ double millisecondsToStop()
     return nanosecondsSince(start) / 1e6;
 }
 
-void measureStop(const Options& options, Report& report)
+void measureStop(const BenchOptions& options, Report& report)
 {
     constexpr std::size_t count = 100'000;
-    const TemporaryDirectory directory;
+    const support::TemporaryDirectory directory;
     platform::LinuxFileSystem files(directory.path());
     RecordedTrace trace(eventsOf(count, 4));
     const TracingPlatform platform(trace, files);
@@ -158,7 +159,7 @@ void measureStop(const Options& options, Report& report)
 
 } // namespace
 
-void measureTrace(const Options& options, Report& report)
+void measureTraceEnd(const BenchOptions& options, Report& report)
 {
     const InProcessPlatform platform;
     measurePairing(options, report);

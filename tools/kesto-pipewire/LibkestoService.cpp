@@ -1,5 +1,5 @@
 // libkesto's callbacks come on its own thread: they store the state, and the loop's next turn reads it.
-#include "kesto-pipewire/ServiceConnection.h"
+#include "kesto-pipewire/LibkestoService.h"
 
 #include "utility/MessageKinds.h"
 
@@ -32,7 +32,7 @@ std::string textOf(const Payload& payload)
 
 } // namespace
 
-ServiceConnection::ServiceConnection(Loop& loop, std::string socketPath, const Diagnostics& diagnostics)
+LibkestoService::LibkestoService(Loop& loop, std::string socketPath, const Diagnostics& diagnostics)
     : loop_(loop),
       socketPath_(std::move(socketPath)),
       diagnostics_(diagnostics),
@@ -40,9 +40,9 @@ ServiceConnection::ServiceConnection(Loop& loop, std::string socketPath, const D
 {
 }
 
-ServiceConnection::~ServiceConnection() = default;
+LibkestoService::~LibkestoService() = default;
 
-void ServiceConnection::open(Handlers handlers)
+void LibkestoService::open(Handlers handlers)
 {
     handlers_ = std::move(handlers);
     kesto::Options options;
@@ -59,7 +59,7 @@ void ServiceConnection::open(Handlers handlers)
     tracer_ = kesto::Tracer(client_);
 }
 
-bool ServiceConnection::close()
+bool LibkestoService::close()
 {
     if (!isConnected_)
         return true; // no started session lacks its end
@@ -71,7 +71,7 @@ bool ServiceConnection::close()
     return status == kesto::Status::Ok;
 }
 
-void ServiceConnection::stateChanged(const kesto::StateChange& change)
+void LibkestoService::stateChanged(const kesto::StateChange& change)
 {
     if (change.reason != kesto::Status::Ok)
         diagnostics_.detail("{}: {}", change.socketPath, kesto::errorText(change.reason));
@@ -80,7 +80,7 @@ void ServiceConnection::stateChanged(const kesto::StateChange& change)
     loop_.wake(stateSignal_);
 }
 
-void ServiceConnection::handleState()
+void LibkestoService::handleState()
 {
     // One signal may stand for a loss and the next connection.
     if (const auto connections = connections_.load(); std::exchange(handledConnections_, connections) != connections) {
@@ -98,7 +98,7 @@ void ServiceConnection::handleState()
 }
 
 // libkesto refuses a call if the service is too slow, or has just gone.
-template <typename Describe> void ServiceConnection::note(ReporterID session, kesto::Status status, Describe describe)
+template <typename Describe> void LibkestoService::note(ReporterID session, kesto::Status status, Describe describe)
 {
     if (diagnostics_.isVerbose())
         diagnostics_.say("{} {}", session, describe());
@@ -106,7 +106,7 @@ template <typename Describe> void ServiceConnection::note(ReporterID session, ke
         diagnostics_.say("the reporting service does not take every call: {}", kesto::errorText(status));
 }
 
-const kesto::Message& ServiceConnection::encode(const Payload& payload)
+const kesto::Message& LibkestoService::encode(const Payload& payload)
 {
     message_.clear();
     for (const auto& entry : payload)
@@ -114,29 +114,29 @@ const kesto::Message& ServiceConnection::encode(const Payload& payload)
     return message_;
 }
 
-void ServiceConnection::create(ReporterID session)
+void LibkestoService::create(ReporterID session)
 {
     note(session, client_.createSession(session), [] { return "create"; });
 }
 
-void ServiceConnection::setServiceType(ReporterID session, ServiceType type)
+void LibkestoService::setServiceType(ReporterID session, ServiceType type)
 {
     note(session, client_.setServiceType(type, session), [type] {
         return KestoReportingUtilityGenerateServiceNameFromServiceType(static_cast<AudioServiceType>(type));
     });
 }
 
-void ServiceConnection::setConfiguration(ReporterID session, const Payload& configuration)
+void LibkestoService::setConfiguration(ReporterID session, const Payload& configuration)
 {
     note(session, client_.setConfiguration(encode(configuration), session), [&] { return textOf(configuration); });
 }
 
-void ServiceConnection::start(ReporterID session)
+void LibkestoService::start(ReporterID session)
 {
     note(session, client_.startSession(session), [] { return "start"; });
 }
 
-void ServiceConnection::send(ReporterID session, Category category, EventType type, const Payload& message)
+void LibkestoService::send(ReporterID session, Category category, EventType type, const Payload& message)
 {
     if (type == EventType::Start)
         tracer_.emit(streamBegins, static_cast<std::uint64_t>(session));
@@ -148,12 +148,12 @@ void ServiceConnection::send(ReporterID session, Category category, EventType ty
     });
 }
 
-void ServiceConnection::stop(ReporterID session)
+void LibkestoService::stop(ReporterID session)
 {
     note(session, client_.stopSession(session), [] { return "stop"; });
 }
 
-void ServiceConnection::destroy(ReporterID session)
+void LibkestoService::destroy(ReporterID session)
 {
     note(session, client_.destroySession(session), [] { return "destroy"; });
 }

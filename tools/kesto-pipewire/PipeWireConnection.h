@@ -17,18 +17,18 @@
 namespace kesto_pipewire {
 
 // All functions run on the thread of the context's loop. Its arguments must outlive it.
-class Connection {
+class PipeWireConnection {
 public:
     // Follows the events of one object of the server until it is destroyed.
     class Bound;
 
     // Calls `lost`, once, when the server has gone; the owner must then destroy the connection, but not from within
     // that call. Returns null if the server is not running.
-    [[nodiscard]] static std::unique_ptr<Connection> open(pw_context& context, const std::string& remote, Graph& graph,
-                                                          std::function<void()> lost);
-    ~Connection();
-    Connection(const Connection&) = delete;
-    Connection& operator=(const Connection&) = delete;
+    [[nodiscard]] static std::unique_ptr<PipeWireConnection> open(pw_context& context, const std::string& remote,
+                                                                  Graph& graph, std::function<void()> lost);
+    ~PipeWireConnection();
+    PipeWireConnection(const PipeWireConnection&) = delete;
+    PipeWireConnection& operator=(const PipeWireConnection&) = delete;
 
     [[nodiscard]] Graph& graph() noexcept { return graph_; }
     [[nodiscard]] pw_registry* registry() noexcept { return registry_; }
@@ -36,7 +36,7 @@ public:
     void followProfiler();
 
 private:
-    Connection(pw_core* core, Graph& graph, std::function<void()> lost);
+    PipeWireConnection(pw_core* core, Graph& graph, std::function<void()> lost);
 
     void objectAppeared(ObjectID id, std::string_view type, const spa_dict& properties);
     void objectRemoved(ObjectID id);

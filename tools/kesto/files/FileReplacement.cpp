@@ -1,6 +1,6 @@
 // The new file is completely on the disk before it gets the name, so that a loss of power leaves the old or the new
 // file.
-#include "kesto/files/Replacement.h"
+#include "kesto/files/FileReplacement.h"
 
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/files/WriteAll.h"

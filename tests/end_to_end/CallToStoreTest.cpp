@@ -30,7 +30,7 @@ Array success(std::uint64_t call)
     return {call, null, true};
 }
 
-class RoadTest : public testing::Test {
+class CallToStoreTest : public testing::Test {
 protected:
     void SetUp() override { kestod.start(); }
     Kestod kestod;
@@ -38,10 +38,10 @@ protected:
 
 auto named(std::string_view name)
 {
-    return Field(&StoredEvent::name, name);
+    return Field(&StoreRow::name, name);
 }
 
-TEST_F(RoadTest, AMessageBecomesTwoStoredEventsWithTheApplicationAdded)
+TEST_F(CallToStoreTest, AMessageBecomesTwoStoredEventsWithTheApplicationAdded)
 {
     WireClient client(kestod.socketPath());
     EXPECT_EQ(client.ask(Create, 42), success(1));
@@ -61,7 +61,7 @@ TEST_F(RoadTest, AMessageBecomesTwoStoredEventsWithTheApplicationAdded)
     EXPECT_EQ(events[1].payload, events[0].payload);
 }
 
-TEST_F(RoadTest, WhatIsAcknowledgedIsKeptWhenTheServiceIsKilled)
+TEST_F(CallToStoreTest, WhatIsAcknowledgedIsKeptWhenTheServiceIsKilled)
 {
     WireClient client(kestod.socketPath());
     client.ask(Create, 1);
@@ -80,7 +80,7 @@ TEST_F(RoadTest, WhatIsAcknowledgedIsKeptWhenTheServiceIsKilled)
     EXPECT_GE(kestod.events("com.quarn.kesto.*").size(), static_cast<std::size_t>(acknowledged));
 }
 
-TEST_F(RoadTest, TwoClientsAtOnceDoNotMix)
+TEST_F(CallToStoreTest, TwoClientsAtOnceDoNotMix)
 {
     WireClient first(kestod.socketPath());
     WireClient second(kestod.socketPath());
@@ -93,11 +93,11 @@ TEST_F(RoadTest, TwoClientsAtOnceDoNotMix)
     EXPECT_EQ(second.ask(GetServiceName, 7), (Array{4, null, 10}));
     first.ask(SendMessage, Dictionary{{"from", "first"}}, playback, typeStart, Array{7});
     second.ask(SendMessage, Dictionary{{"from", "second"}}, playback, typeStart, Array{7});
-    EXPECT_THAT(kestod.events("com.quarn.generic.*"), ElementsAre(Field(&StoredEvent::payload, HasSubstr("first"))));
-    EXPECT_THAT(kestod.events("com.quarn.alerts.*"), ElementsAre(Field(&StoredEvent::payload, HasSubstr("second"))));
+    EXPECT_THAT(kestod.events("com.quarn.generic.*"), ElementsAre(Field(&StoreRow::payload, HasSubstr("first"))));
+    EXPECT_THAT(kestod.events("com.quarn.alerts.*"), ElementsAre(Field(&StoreRow::payload, HasSubstr("second"))));
 }
 
-TEST_F(RoadTest, ASessionOfAnotherClientIsReachedBySendingAndValidatingButNotByStarting)
+TEST_F(CallToStoreTest, ASessionOfAnotherClientIsReachedBySendingAndValidatingButNotByStarting)
 {
     WireClient owner(kestod.socketPath());
     owner.ask(Create, 5);
@@ -110,7 +110,7 @@ TEST_F(RoadTest, ASessionOfAnotherClientIsReachedBySendingAndValidatingButNotByS
     EXPECT_EQ(other.ask(GetAllReporters), (Array{4, null, Array{5}}));
 }
 
-TEST_F(RoadTest, TheServiceTypeOfNoSessionIsAnsweredTwice)
+TEST_F(CallToStoreTest, TheServiceTypeOfNoSessionIsAnsweredTwice)
 {
     WireClient client(kestod.socketPath());
     const auto call = client.call(GetServiceName, 0);
@@ -119,7 +119,7 @@ TEST_F(RoadTest, TheServiceTypeOfNoSessionIsAnsweredTwice)
     EXPECT_EQ(client.ask(Validate, 99), (Array{2, null, Dictionary{{"reporterID", 0}, {"serviceType", 65535}}}));
 }
 
-TEST_F(RoadTest, TheAnswerToAStartIsHeldUntilTheStopAndOtherCallsOvertakeIt)
+TEST_F(CallToStoreTest, TheAnswerToAStartIsHeldUntilTheStopAndOtherCallsOvertakeIt)
 {
     WireClient client(kestod.socketPath());
     client.ask(Create, 1);
@@ -131,7 +131,7 @@ TEST_F(RoadTest, TheAnswerToAStartIsHeldUntilTheStopAndOtherCallsOvertakeIt)
     EXPECT_EQ(client.nextReply(), success(stop));
 }
 
-TEST_F(RoadTest, WithoutAListAllStartedSessionsGetTheMessage)
+TEST_F(CallToStoreTest, WithoutAListAllStartedSessionsGetTheMessage)
 {
     WireClient first(kestod.socketPath());
     WireClient second(kestod.socketPath());
@@ -148,7 +148,7 @@ TEST_F(RoadTest, WithoutAListAllStartedSessionsGetTheMessage)
                             named("com.quarn.kesto.Playback.Stop"), named("com.quarn.alerts.Playback.Stop")));
 }
 
-TEST_F(RoadTest, WithoutAListAndWithoutSessionsTheMessageStandsAlone)
+TEST_F(CallToStoreTest, WithoutAListAndWithoutSessionsTheMessageStandsAlone)
 {
     WireClient client(kestod.socketPath());
     EXPECT_EQ(client.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, null), (Array{1, null}));
@@ -158,18 +158,18 @@ TEST_F(RoadTest, WithoutAListAndWithoutSessionsTheMessageStandsAlone)
     EXPECT_EQ(events[0].payload, R"({"a":1,"HostApplicationDisplayID":"Unknown"})");
 }
 
-TEST_F(RoadTest, AnEmptyListGoesNowhere)
+TEST_F(CallToStoreTest, AnEmptyListGoesNowhere)
 {
     WireClient client(kestod.socketPath());
     client.ask(Create, 1);
     EXPECT_EQ(client.ask(SendMessage, Dictionary{{"to", "nobody"}}, playback, typeStart, Array{}), (Array{2, null}));
     client.ask(SendMessage, Dictionary{{"to", "one"}}, playback, typeStart, Array{1});
     EXPECT_THAT(kestod.events(),
-                ElementsAre(Field(&StoredEvent::payload, HasSubstr(R"("to":"one")")),
-                            Field(&StoredEvent::payload, HasSubstr(R"("to":"one")"))));
+                ElementsAre(Field(&StoreRow::payload, HasSubstr(R"("to":"one")")),
+                            Field(&StoreRow::payload, HasSubstr(R"("to":"one")"))));
 }
 
-TEST_F(RoadTest, AClientThatDisconnectsLeavesAnUptimeEvent)
+TEST_F(CallToStoreTest, AClientThatDisconnectsLeavesAnUptimeEvent)
 {
     WireClient client(kestod.socketPath());
     client.ask(Create, 1);
@@ -184,7 +184,7 @@ TEST_F(RoadTest, AClientThatDisconnectsLeavesAnUptimeEvent)
     EXPECT_FALSE(kestod.log().contains("interruptionHandler"));
 }
 
-TEST_F(RoadTest, AClientThatClosesItsSendingSideHasItsCallsCarriedOutAndGetsNoMoreAnswersThanHadLeft)
+TEST_F(CallToStoreTest, AClientThatClosesItsSendingSideHasItsCallsCarriedOutAndGetsNoMoreAnswersThanHadLeft)
 {
     constexpr std::uint64_t count = 200;
     WireClient client(kestod.socketPath());
@@ -211,7 +211,7 @@ TEST_F(RoadTest, AClientThatClosesItsSendingSideHasItsCallsCarriedOutAndGetsNoMo
     EXPECT_FALSE(kestod.log().contains("interruptionHandler"));
 }
 
-TEST_F(RoadTest, AResetIsAnInterruptionAndThenAnInvalidationAndStopsSessionsOnce)
+TEST_F(CallToStoreTest, AResetIsAnInterruptionAndThenAnInvalidationAndStopsSessionsOnce)
 {
     WireClient client(kestod.socketPath());
     client.ask(Create, 77);
@@ -265,7 +265,7 @@ TEST(CrowdedRoadTest, EveryConnectionThatComesAndVanishesBesideABusyClientIsRegi
     EXPECT_EQ(kestod.events(uptimeEvent).size() + kestod.countInLog("clientProcessName is nil"), all);
 }
 
-TEST_F(RoadTest, KillServiceEndsTheProcessWithStatus2)
+TEST_F(CallToStoreTest, KillServiceEndsTheProcessWithStatus2)
 {
     WireClient client(kestod.socketPath());
     client.call(KillService);
@@ -274,7 +274,7 @@ TEST_F(RoadTest, KillServiceEndsTheProcessWithStatus2)
     EXPECT_THAT(kestod.log(), HasSubstr("DESTROYING SERVICE"));
 }
 
-TEST_F(RoadTest, AServiceThatWasKilledStartsAgainAtItsStaleSocket)
+TEST_F(CallToStoreTest, AServiceThatWasKilledStartsAgainAtItsStaleSocket)
 {
     WireClient(kestod.socketPath()).ask(SendMessage, Dictionary{{"run", 1}}, playback, typeStart, null);
     kestod.kill();
@@ -330,7 +330,7 @@ TEST(CustomerRoadTest, EventsKeepTheTimeStampThatRecordedMessagesLose)
     client.nextReply();
     client.nextReply();
     EXPECT_THAT(kestod.events("com.quarn.kesto.Playback.Start"),
-                ElementsAre(Field(&StoredEvent::payload, HasSubstr("kestoreporting_timestamp"))));
+                ElementsAre(Field(&StoreRow::payload, HasSubstr("kestoreporting_timestamp"))));
     EXPECT_THAT(kestod.events("com.quarn.kesto.Volume.Summary"), SizeIs(0)); // every stretch measures 0
     EXPECT_FALSE(std::filesystem::exists(kestod.directory() / "logs/Audio"));
 }
@@ -369,7 +369,7 @@ TEST(InternalRoadTest, PlayingBecomesAVolumeEventAndASummaryFile)
     client.nextReply();
     client.nextReply();
     EXPECT_THAT(kestod.events("com.quarn.kesto.Volume.Summary"),
-                ElementsAre(Field(&StoredEvent::payload, HasSubstr(R"("play_seconds":10.6)"))));
+                ElementsAre(Field(&StoreRow::payload, HasSubstr(R"("play_seconds":10.6)"))));
     std::size_t files = 0;
     for (const auto& file : std::filesystem::directory_iterator(kestod.directory() / "logs/Audio/Reporting")) {
         ++files;

@@ -9,6 +9,7 @@
 #include "platform/linux/trace/TracefsEmitter.h"
 #include "platform/linux/trace/TracefsInstance.h"
 #include "support/ChildProcess.h"
+#include "support/TemporaryDirectory.h"
 
 #include <cerrno>
 #include <chrono>
@@ -82,7 +83,7 @@ double mergingRate(std::uint32_t processors)
     return static_cast<double>(events) * 1e3 / (cost * readings);
 }
 
-void measureMerging(const Options& options, Report& report)
+void measureMerging(const BenchOptions& options, Report& report)
 {
     const auto rates = compete(
         options, "pages of the trace", [] { return mergingRate(1); }, [] { return mergingRate(2); },
@@ -131,7 +132,7 @@ private:
     }
 
     static inline constinit platform::LogCategory category_{"com.quarn.kesto", "bench"};
-    const TemporaryDirectory directory_;
+    const support::TemporaryDirectory directory_;
     std::unique_ptr<platform::LinuxConnectionListener> listener_;
     std::thread thread_;
 };
@@ -187,7 +188,7 @@ private:
     kesto::Client client_;
 };
 
-void measureSilence(const Options& options, Report& report)
+void measureSilence(const BenchOptions& options, Report& report)
 {
     constexpr std::size_t count = 10'000'000;
     const platform::FileDescriptor nothing(::open("/dev/null", O_WRONLY | O_CLOEXEC));
@@ -201,7 +202,7 @@ void measureSilence(const Options& options, Report& report)
 
 constexpr std::string_view emitting = "an event while a trace runs";
 
-void measureEmittingOn(const std::filesystem::path& tracefs, const std::string& name, const Options& options,
+void measureEmittingOn(const std::filesystem::path& tracefs, const std::string& name, const BenchOptions& options,
                        Report& report)
 {
     constexpr std::size_t count = 100'000;
@@ -216,12 +217,12 @@ void measureEmittingOn(const std::filesystem::path& tracefs, const std::string& 
         options, "emitting", [&] { return all.costOfClient(count); }, [&] { return all.costOfService(count); },
         [&] { return all.costOfWriting(count); });
     instance->switchOff();
-    const Peer write{"a bare write to the marker", costs[2]};
+    const PeerFigure write{"a bare write to the marker", costs[2]};
     report.add({fmt::format("{}, a client's", emitting), "ns", costs[0], write, Target::ratioAtMost(1.2)});
     report.add({fmt::format("{}, the service's", emitting), "ns", costs[1], write, Target::ratioAtMost(1.2)});
 }
 
-void measureEmitting(const Options& options, Report& report)
+void measureEmitting(const BenchOptions& options, Report& report)
 {
     const std::string name = "kesto-bench";
     const auto tracefs = platform::findTracefs("/proc/self/mounts");
@@ -234,7 +235,7 @@ void measureEmitting(const Options& options, Report& report)
 
 } // namespace
 
-void measureTracing(const Options& options, Report& report)
+void measureTraceEventCost(const BenchOptions& options, Report& report)
 {
     measureMerging(options, report);
     measureSilence(options, report);

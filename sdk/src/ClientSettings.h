@@ -47,7 +47,7 @@ private:
     kesto_release_callback release_;
 };
 
-struct Settings {
+struct ClientSettings {
     std::vector<std::string> paths;
     std::size_t queueBytes;
     std::size_t unansweredLimit;

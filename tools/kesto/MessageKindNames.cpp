@@ -1,5 +1,5 @@
 // The vocabulary only maps numbers to names, so these functions try every number that has a name.
-#include "kesto/Names.h"
+#include "kesto/MessageKindNames.h"
 
 #include <algorithm>
 #include <array>

@@ -1,5 +1,5 @@
 // Cut first: a character that the cut halved would not be one any more.
-#include "kesto-pipewire/Text.h"
+#include "kesto-pipewire/ValidText.h"
 
 #include "foundation/values/String.h"
 

@@ -58,7 +58,7 @@ private:
 
 } // namespace
 
-void measureSession(const Options& options, Report& report)
+void measureGrowingSession(const BenchOptions& options, Report& report)
 {
     const InProcessPlatform platform;
     std::vector<double> earlyCosts;
@@ -80,9 +80,9 @@ void measureSession(const Options& options, Report& report)
     }
     clearProgress();
     report.add({fmt::format("recording the {}th distinct message of a session", late), "ns", lateCosts,
-                Peer{fmt::format("the {}th", early), earlyCosts}, Target::ratioAtMost(1.2)});
+                PeerFigure{fmt::format("the {}th", early), earlyCosts}, Target::ratioAtMost(1.2)});
     const std::vector<double> encodedSize(bytes.size(), static_cast<double>(foundation::cborSize(sampleMessage())));
-    report.add({fmt::format("memory a recorded message, of {}", late), "B", bytes, Peer{"its CBOR", encodedSize},
+    report.add({fmt::format("memory a recorded message, of {}", late), "B", bytes, PeerFigure{"its CBOR", encodedSize},
                 Target::ratioAtMost(1.5)});
 }
 

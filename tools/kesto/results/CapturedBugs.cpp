@@ -1,5 +1,5 @@
 // The service may change the folder meanwhile: captures that vanish are left out.
-#include "kesto/results/BugCaptures.h"
+#include "kesto/results/CapturedBugs.h"
 
 #include "kesto/files/JsonReader.h"
 
@@ -59,9 +59,9 @@ Array linesOf(std::string_view text)
 }
 
 // "00000007-20260131T180000Z" is number 7, of that time.
-std::optional<BugCapture> parseName(const std::string& name)
+std::optional<CapturedBug> parseName(const std::string& name)
 {
-    BugCapture capture;
+    CapturedBug capture;
     const auto [end, error] = std::from_chars(name.data(), name.data() + name.size(), capture.number);
     if (error != std::errc() || end == name.data() + name.size() || *end != '-')
         return std::nullopt;
@@ -98,9 +98,9 @@ std::optional<std::uint64_t> bytesOf(const fs::path& state)
 
 } // namespace
 
-std::vector<BugCapture> bugCapturesIn(const fs::path& directory)
+std::vector<CapturedBug> capturedBugsIn(const fs::path& directory)
 {
-    std::vector<BugCapture> captures;
+    std::vector<CapturedBug> captures;
     std::error_code error;
     std::error_code ignored; // the service may remove a capture while it is being read
     fs::directory_iterator entry(directory, error);
@@ -118,11 +118,11 @@ std::vector<BugCapture> bugCapturesIn(const fs::path& directory)
     }
     if (error)
         throw std::runtime_error(fmt::format("cannot read {}: {}", directory.native(), error.message()));
-    std::ranges::sort(captures, {}, &BugCapture::number);
+    std::ranges::sort(captures, {}, &CapturedBug::number);
     return captures;
 }
 
-Dictionary stateOf(const BugCapture& capture)
+Dictionary stateOf(const CapturedBug& capture)
 {
     Dictionary::Entries entries;
     for (const fs::path& file : filesIn(capture.directory / "state")) {

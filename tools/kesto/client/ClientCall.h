@@ -9,7 +9,7 @@
 #include <string_view>
 #include <vector>
 
-struct Call {
+struct ClientCall {
     kesto::Operation operation = kesto::Operation::GetAllReporters;
     kesto::ReporterID reporter = 0;
     kesto::ServiceType serviceType = kesto::ServiceType::Generic;
@@ -20,7 +20,7 @@ struct Call {
 };
 
 // The call, or what is wrong with the line and what was expected.
-[[nodiscard]] std::expected<Call, std::string> parseCall(std::string_view line);
+[[nodiscard]] std::expected<ClientCall, std::string> parseClientCall(std::string_view line);
 
 // Has the client carry it out.
-[[nodiscard]] kesto::Status submit(kesto::Client& client, const Call& call, kesto::AnswerCallback answered);
+[[nodiscard]] kesto::Status submit(kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered);

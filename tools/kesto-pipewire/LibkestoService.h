@@ -18,7 +18,7 @@
 namespace kesto_pipewire {
 
 // All functions run on the loop's thread. The loop and the diagnostics must outlive it.
-class ServiceConnection : public ReportingService {
+class LibkestoService : public ReportingService {
 public:
     struct Handlers {
         std::function<void()> appeared; // a new connection, whose service has no sessions
@@ -26,8 +26,8 @@ public:
     };
 
     // An empty path means the service's default.
-    ServiceConnection(Loop& loop, std::string socketPath, const Diagnostics& diagnostics);
-    ~ServiceConnection() override;
+    LibkestoService(Loop& loop, std::string socketPath, const Diagnostics& diagnostics);
+    ~LibkestoService() override;
 
     // Starts connecting. Throws std::system_error if the system refuses a resource.
     void open(Handlers handlers);

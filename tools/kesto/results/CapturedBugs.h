@@ -9,7 +9,7 @@
 #include <string>
 #include <vector>
 
-struct BugCapture {
+struct CapturedBug {
     std::uint64_t number = 0;
     double time = 0; // seconds since 1970
     std::filesystem::path directory;
@@ -19,8 +19,8 @@ struct BugCapture {
 };
 
 // All captures, the oldest first. Throws std::runtime_error with a line for a person.
-[[nodiscard]] std::vector<BugCapture> bugCapturesIn(const std::filesystem::path& directory);
+[[nodiscard]] std::vector<CapturedBug> capturedBugsIn(const std::filesystem::path& directory);
 
 // The state of the device: the content of each file by its name without extension, sorted by name. A log is the list of
 // its lines; a file that cannot be read is null.
-[[nodiscard]] foundation::Dictionary stateOf(const BugCapture& capture);
+[[nodiscard]] foundation::Dictionary stateOf(const CapturedBug& capture);

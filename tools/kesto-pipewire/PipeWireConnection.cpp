@@ -1,5 +1,5 @@
 // A class for each kind of bound object: its listener decodes the object's events and passes them to the graph.
-#include "kesto-pipewire/Connection.h"
+#include "kesto-pipewire/PipeWireConnection.h"
 
 #include "kesto-pipewire/Pods.h"
 
@@ -45,9 +45,9 @@ Identity identityOf(const spa_dict& properties)
 
 } // namespace
 
-class Connection::Bound {
+class PipeWireConnection::Bound {
 public:
-    Bound(Connection& connection, ObjectID id, const char* type, std::uint32_t version)
+    Bound(PipeWireConnection& connection, ObjectID id, const char* type, std::uint32_t version)
         : connection_(connection),
           id_(id),
           proxy_(static_cast<pw_proxy*>(pw_registry_bind(connection.registry(), id, type, version, 0)))
@@ -64,7 +64,7 @@ public:
 protected:
     [[nodiscard]] Graph& graph() noexcept { return connection_.graph(); }
 
-    Connection& connection_;
+    PipeWireConnection& connection_;
     const ObjectID id_;
     pw_proxy* const proxy_;
     spa_hook hook_{}; // the library removes it with the proxy
@@ -72,9 +72,9 @@ protected:
 
 namespace {
 
-class BoundClient : public Connection::Bound {
+class BoundClient : public PipeWireConnection::Bound {
 public:
-    BoundClient(Connection& connection, ObjectID id)
+    BoundClient(PipeWireConnection& connection, ObjectID id)
         : Bound(connection, id, PW_TYPE_INTERFACE_Client, PW_VERSION_CLIENT)
     {
         if (proxy_)
@@ -92,9 +92,10 @@ private:
     static constexpr pw_client_events events{PW_VERSION_CLIENT_EVENTS, hearInfo, nullptr};
 };
 
-class BoundStream : public Connection::Bound {
+class BoundStream : public PipeWireConnection::Bound {
 public:
-    BoundStream(Connection& connection, ObjectID id) : Bound(connection, id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE)
+    BoundStream(PipeWireConnection& connection, ObjectID id)
+        : Bound(connection, id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE)
     {
         if (!proxy_)
             return;
@@ -132,9 +133,10 @@ private:
     static constexpr pw_node_events events{PW_VERSION_NODE_EVENTS, hearInfo, hearParameter};
 };
 
-class BoundDevice : public Connection::Bound {
+class BoundDevice : public PipeWireConnection::Bound {
 public:
-    BoundDevice(Connection& connection, ObjectID id) : Bound(connection, id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE)
+    BoundDevice(PipeWireConnection& connection, ObjectID id)
+        : Bound(connection, id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE)
     {
         if (proxy_)
             pw_node_add_listener(reinterpret_cast<pw_node*>(proxy_), &hook_, &events, this);
@@ -163,9 +165,9 @@ private:
     static constexpr pw_node_events events{PW_VERSION_NODE_EVENTS, hearInfo, nullptr};
 };
 
-class BoundProfiler : public Connection::Bound {
+class BoundProfiler : public PipeWireConnection::Bound {
 public:
-    BoundProfiler(Connection& connection, ObjectID id)
+    BoundProfiler(PipeWireConnection& connection, ObjectID id)
         : Bound(connection, id, PW_TYPE_INTERFACE_Profiler, PW_VERSION_PROFILER)
     {
         if (proxy_)
@@ -184,40 +186,40 @@ private:
 
 } // namespace
 
-const pw_core_events Connection::coreEvents{
+const pw_core_events PipeWireConnection::coreEvents{
     .version = PW_VERSION_CORE_EVENTS,
     .info = nullptr,
     .done = nullptr,
     .ping = nullptr,
     .error = [](void* data, std::uint32_t id, int, int error,
-                const char*) { static_cast<Connection*>(data)->failed(id, error); },
+                const char*) { static_cast<PipeWireConnection*>(data)->failed(id, error); },
     .remove_id = nullptr,
     .bound_id = nullptr,
     .add_mem = nullptr,
     .remove_mem = nullptr,
 };
 
-const pw_registry_events Connection::registryEvents{
+const pw_registry_events PipeWireConnection::registryEvents{
     .version = PW_VERSION_REGISTRY_EVENTS,
     .global =
         [](void* data, std::uint32_t id, std::uint32_t, const char* type, std::uint32_t, const spa_dict* properties) {
             const spa_dict none{0, 0, nullptr};
-            static_cast<Connection*>(data)->objectAppeared(id, type, properties ? *properties : none);
+            static_cast<PipeWireConnection*>(data)->objectAppeared(id, type, properties ? *properties : none);
         },
-    .global_remove = [](void* data, std::uint32_t id) { static_cast<Connection*>(data)->objectRemoved(id); },
+    .global_remove = [](void* data, std::uint32_t id) { static_cast<PipeWireConnection*>(data)->objectRemoved(id); },
 };
 
-std::unique_ptr<Connection> Connection::open(pw_context& context, const std::string& remote, Graph& graph,
-                                             std::function<void()> lost)
+std::unique_ptr<PipeWireConnection> PipeWireConnection::open(pw_context& context, const std::string& remote,
+                                                             Graph& graph, std::function<void()> lost)
 {
     auto* properties = pw_properties_new(PW_KEY_APP_NAME, "kesto-pipewire", nullptr);
     if (!remote.empty())
         pw_properties_set(properties, PW_KEY_REMOTE_NAME, remote.c_str());
     auto* core = pw_context_connect(&context, properties, 0);
-    return core ? std::unique_ptr<Connection>(new Connection(core, graph, std::move(lost))) : nullptr;
+    return core ? std::unique_ptr<PipeWireConnection>(new PipeWireConnection(core, graph, std::move(lost))) : nullptr;
 }
 
-Connection::Connection(pw_core* core, Graph& graph, std::function<void()> lost)
+PipeWireConnection::PipeWireConnection(pw_core* core, Graph& graph, std::function<void()> lost)
     : graph_(graph),
       lost_(std::move(lost)),
       core_(core),
@@ -227,7 +229,7 @@ Connection::Connection(pw_core* core, Graph& graph, std::function<void()> lost)
     pw_registry_add_listener(registry_, &registryHook_, &registryEvents, this);
 }
 
-Connection::~Connection()
+PipeWireConnection::~PipeWireConnection()
 {
     profiler_.reset();
     bound_.clear();
@@ -238,13 +240,13 @@ Connection::~Connection()
 }
 
 // An error of a single object means that it has gone, or has no format yet; the connection goes on.
-void Connection::failed(ObjectID id, int error)
+void PipeWireConnection::failed(ObjectID id, int error)
 {
     if (id == PW_ID_CORE && error == -EPIPE && lost_)
         std::exchange(lost_, nullptr)();
 }
 
-void Connection::objectAppeared(ObjectID id, std::string_view type, const spa_dict& properties)
+void PipeWireConnection::objectAppeared(ObjectID id, std::string_view type, const spa_dict& properties)
 {
     if (type == PW_TYPE_INTERFACE_Node) {
         nodeAppeared(id, properties);
@@ -261,7 +263,7 @@ void Connection::objectAppeared(ObjectID id, std::string_view type, const spa_di
     }
 }
 
-void Connection::nodeAppeared(ObjectID id, const spa_dict& properties)
+void PipeWireConnection::nodeAppeared(ObjectID id, const spa_dict& properties)
 {
     const NodeAnnouncement node{
         .serial = numberOf<StreamSerial>(properties, PW_KEY_OBJECT_SERIAL).value_or(id),
@@ -276,7 +278,7 @@ void Connection::nodeAppeared(ObjectID id, const spa_dict& properties)
     }
 }
 
-void Connection::objectRemoved(ObjectID id)
+void PipeWireConnection::objectRemoved(ObjectID id)
 {
     bound_.erase(id);
     if (profilerID_ == id)
@@ -285,7 +287,7 @@ void Connection::objectRemoved(ObjectID id)
     followProfiler();
 }
 
-void Connection::followProfiler()
+void PipeWireConnection::followProfiler()
 {
     const bool wanted = profilerID_ && graph_.anyStreamRuns();
     if (wanted && !profiler_)

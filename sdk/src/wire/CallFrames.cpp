@@ -1,5 +1,5 @@
 // A call's shape is known, so its frame is written straight from what the caller gave, without values in between.
-#include "wire/Wire.h"
+#include "wire/CallFrames.h"
 
 #include "client/ServiceOperations.h"
 #include "platform/linux/connection/FrameReader.h"

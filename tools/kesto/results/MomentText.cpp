@@ -1,5 +1,5 @@
 // The forms are tried one after the other; the first that matches the whole text counts.
-#include "kesto/results/Moment.h"
+#include "kesto/results/MomentText.h"
 
 #include <array>
 #include <charconv>
