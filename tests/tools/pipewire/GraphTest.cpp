@@ -1,8 +1,8 @@
 // The graph of streams, with every order of events that a server may send.
 
 #include "kesto-pipewire/Graph.h"
-#include "tools/pipewire/RecordingDevices.h"
-#include "tools/pipewire/RecordingListener.h"
+#include "tools/pipewire/RecordingDeviceListener.h"
+#include "tools/pipewire/RecordingStreamListener.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -38,8 +38,8 @@ protected:
     }
 
     Moment now{1000, 10};
-    RecordingListener listener;
-    RecordingDevices devices;
+    RecordingStreamListener listener;
+    RecordingDeviceListener devices;
     Graph graph{listener, devices};
 };
 

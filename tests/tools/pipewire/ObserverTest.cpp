@@ -2,7 +2,7 @@
 
 #include "kesto-pipewire/Observer.h"
 #include "tools/pipewire/HeadlessPipeWire.h"
-#include "tools/pipewire/RecordingDevices.h"
+#include "tools/pipewire/RecordingDeviceListener.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -156,7 +156,7 @@ protected:
 
     HeadlessPipeWire server;
     Diagnostics diagnostics{false};
-    RecordingDevices devices{[this] { quitWhenItHappened(); }};
+    RecordingDeviceListener devices{[this] { quitWhenItHappened(); }};
     SeenStreams seen{[this] { quitWhenItHappened(); }};
     std::optional<Loop> loop;
     Source timeout;

@@ -3,7 +3,7 @@
 #include "platform/linux/bugs/BugCaptureFolder.h"
 
 #include "platform/linux/files/FilesAt.h"
-#include "platform/linux/files/OldestFirst.h"
+#include "platform/linux/files/Surplus.h"
 #include "platform/linux/files/SystemError.h"
 
 #include <algorithm>

@@ -3,7 +3,7 @@
 #include "platform/linux/diagnostics/FolderKeeper.h"
 
 #include "platform/linux/files/FilesAt.h"
-#include "platform/linux/files/OldestFirst.h"
+#include "platform/linux/files/Surplus.h"
 
 #include <algorithm>
 #include <cerrno>

@@ -14,9 +14,9 @@
 
 namespace kesto_pipewire {
 
-class RecordingDevices : public DeviceListener {
+class RecordingDeviceListener : public DeviceListener {
 public:
-    explicit RecordingDevices(std::function<void()> changed = [] { }) : changed_(std::move(changed)) { }
+    explicit RecordingDeviceListener(std::function<void()> changed = [] { }) : changed_(std::move(changed)) { }
 
     void deviceAppeared(DeviceSerial device, const DeviceDescription& description) override
     {

@@ -11,7 +11,7 @@
 
 namespace kesto_pipewire {
 
-class RecordingListener : public StreamListener {
+class RecordingStreamListener : public StreamListener {
 public:
     void appeared(StreamSerial stream, const StreamDescription& description, Moment) override
     {
