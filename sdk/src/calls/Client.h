@@ -43,7 +43,7 @@ public:
 
     [[nodiscard]] kesto_state state() const noexcept { return courier_.state(); }
     // Null when the client was not to have one.
-    [[nodiscard]] const kesto_tracer* tracer() const noexcept { return courier_.tracer(); }
+    [[nodiscard]] const kesto_tracer* tracer() const noexcept { return courier_.emitter(); }
     [[nodiscard]] kesto_statistics statistics() const noexcept { return counters_.statistics(); }
     void countUnusable() noexcept { ++counters_.droppedUnusable; }
 

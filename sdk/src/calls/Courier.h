@@ -44,7 +44,7 @@ public:
     void stop() noexcept;
     [[nodiscard]] kesto_state state() const noexcept { return state_.load(); }
     // Any thread.
-    [[nodiscard]] const AttachableEmitter* tracer() const noexcept { return settings_.emitter.get(); }
+    [[nodiscard]] const AttachableEmitter* emitter() const noexcept { return settings_.emitter.get(); }
 
     // Whether the caller is being told of a change of state. What it gives then, on the client's thread, goes ahead of
     // what waits in the mailbox: a message that was sent while the connection was made finds the sessions that are made
