@@ -433,6 +433,27 @@ TEST_P(KernelTraceContract, LetsACompletionHandlerDestroyItsSession)
     EXPECT_EQ(session, nullptr);
 }
 
+TEST_P(KernelTraceContract, LetsACompletionHandlerEndItsSessionAgainAndStartAnother)
+{
+    support::Progress progress;
+    bool isDone = false;
+    const auto queue = subject->queues().makeSerialQueue("trace", {});
+    const auto session = subject->trace().createTraceSession();
+    std::unique_ptr<KernelTraceSession> other;
+    session->setCompletionHandler([&] {
+        session->end();
+        EXPECT_TRUE(subject->trace().isAvailable());
+        other = subject->trace().createTraceSession();
+        other->setCompletionHandler([&] { progress.change([&] { isDone = true; }); });
+        EXPECT_EQ(other->start(queue), 0);
+        other->end();
+    });
+    ASSERT_EQ(session->start(queue), 0);
+    session->end();
+    subject->work();
+    EXPECT_TRUE(progress.waitFor([&] { return isDone; }));
+}
+
 TEST_P(KernelTraceContract, HoldsNothingOfASessionThatIsGone)
 {
     auto held = std::make_shared<int>(7);

@@ -13,9 +13,6 @@
 #include <utility>
 
 namespace platform {
-namespace {
-
-} // namespace
 
 EmitterAccess::~EmitterAccess()
 {
@@ -48,28 +45,35 @@ void EmitterAccess::forget(const void* asker)
 std::error_code EmitterAccess::open(int marker)
 {
     constexpr int seals = F_SEAL_SHRINK | F_SEAL_GROW | F_SEAL_FUTURE_WRITE | F_SEAL_SEAL;
+    const foundation::Lock lock(lock_);
+    assert(!descriptors_);
+    FileDescriptor page(::memfd_create("kesto-trace", MFD_CLOEXEC | MFD_ALLOW_SEALING));
+    if (!page || ::ftruncate(page.get(), TraceSwitchPage::size) != 0)
+        return systemError();
+    void* const mapping = ::mmap(nullptr, TraceSwitchPage::size, PROT_READ | PROT_WRITE, MAP_SHARED, page.get(), 0);
+    if (mapping == MAP_FAILED)
+        return systemError();
+    mapping_ = mapping;
+    if (::fcntl(page.get(), F_ADD_SEALS, seals) != 0)
+        return systemError();
+    page_ = std::move(page);
+    descriptors_ = {.marker = marker, .page = page_.get()};
+    return {};
+}
+
+void EmitterAccess::answerWaiting()
+{
     std::map<const void*, Answer> waiting;
     EmitterDescriptors descriptors;
     {
         const foundation::Lock lock(lock_);
-        assert(!descriptors_);
-        FileDescriptor page(::memfd_create("kesto-trace", MFD_CLOEXEC | MFD_ALLOW_SEALING));
-        if (!page || ::ftruncate(page.get(), TraceSwitchPage::size) != 0)
-            return systemError();
-        void* const mapping = ::mmap(nullptr, TraceSwitchPage::size, PROT_READ | PROT_WRITE, MAP_SHARED, page.get(), 0);
-        if (mapping == MAP_FAILED)
-            return systemError();
-        mapping_ = mapping;
-        if (::fcntl(page.get(), F_ADD_SEALS, seals) != 0)
-            return systemError();
-        page_ = std::move(page);
-        descriptors = {.marker = marker, .page = page_.get()};
-        descriptors_ = descriptors;
+        if (!descriptors_)
+            return;
+        descriptors = *descriptors_;
         waiting = std::exchange(waiting_, {});
     }
     for (auto& [asker, answer] : waiting)
         answer(descriptors);
-    return {};
 }
 
 void EmitterAccess::setTracing(bool isTracing) noexcept

@@ -32,13 +32,15 @@ public:
     EmitterAccess(const EmitterAccess&) = delete;
     EmitterAccess& operator=(const EmitterAccess&) = delete;
 
-    // Answers once: now or in `open`, or never if the asker is forgotten before.
+    // Answers once: now, or in `answerWaiting`, or never if the asker is forgotten before.
     void ask(const void* asker, Answer answer);
     void forget(const void* asker);
 
-    // Sets the marker, which must stay open as long as this object lives; makes the page and answers all waiting
-    // askers. Call it once.
+    // Sets the marker, which must stay open as long as this object lives, and makes the page. Call it once.
     [[nodiscard]] std::error_code open(int marker);
+    // Answers all waiting askers; without a page it does nothing. An answer may use the trace, so call it without a
+    // lock.
+    void answerWaiting();
     // Writes to the page whether a trace runs; without a page it does nothing.
     void setTracing(bool isTracing) noexcept;
 

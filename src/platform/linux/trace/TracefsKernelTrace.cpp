@@ -116,14 +116,18 @@ TracefsKernelTrace::~TracefsKernelTrace()
 
 bool TracefsKernelTrace::isAvailable()
 {
-    const foundation::Lock lock(lock_);
-    return setUp();
+    {
+        const foundation::Lock lock(lock_);
+        if (!setUp())
+            return false;
+    }
+    access_.answerWaiting();
+    return true;
 }
 
 std::unique_ptr<KernelTraceSession> TracefsKernelTrace::createTraceSession()
 {
-    const foundation::Lock lock(lock_);
-    return setUp() ? std::make_unique<Session>(*this) : nullptr;
+    return isAvailable() ? std::make_unique<Session>(*this) : nullptr;
 }
 
 std::expected<TracefsInstance, TracefsFailure> TracefsKernelTrace::openInstance() const

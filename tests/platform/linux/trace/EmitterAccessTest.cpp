@@ -63,8 +63,11 @@ TEST_F(EmitterAccessTest, AnswersOnceThereIsSomethingToHandOut)
     std::vector<int> answers;
     access.ask(&answers, [&](const EmitterDescriptors& descriptors) { answers.push_back(descriptors.marker); });
     access.setTracing(true);
+    access.answerWaiting();
     EXPECT_THAT(answers, IsEmpty());
     ASSERT_FALSE(access.open(marker.in.get()));
+    access.answerWaiting();
+    access.answerWaiting();
     EXPECT_THAT(answers, ElementsAre(marker.in.get()));
     access.ask(&answers, [&](const EmitterDescriptors& descriptors) { answers.push_back(descriptors.marker); });
     EXPECT_EQ(answers.size(), 2U);
@@ -76,6 +79,7 @@ TEST_F(EmitterAccessTest, ForgetsWhoDoesNotWaitAnyMore)
     access.ask(this, [&](const EmitterDescriptors&) { isAnswered = true; });
     access.forget(this);
     ASSERT_FALSE(access.open(marker.in.get()));
+    access.answerWaiting();
     EXPECT_FALSE(isAnswered);
 }
 
@@ -196,6 +200,7 @@ TEST_F(EmitterAccessConnections, AreAnsweredWhenTheFirstTraceStarts)
     ASSERT_TRUE(waitForHistory(record, {"call 8"})) << "the service's own calls go on, and see nothing of the request";
     EXPECT_FALSE(client.hasSomethingToRead());
     ASSERT_FALSE(access.open(marker.in.get()));
+    access.answerWaiting();
     const Received received = receive(client);
     EXPECT_THAT(received.numbers, ElementsAre(7));
     EXPECT_EQ(received.descriptors.size(), 2U);
@@ -235,6 +240,7 @@ TEST_F(EmitterAccessConnections, ThatAreOverAreNotAnswered)
     records.at(0)->calls.clear();
     EXPECT_EQ(records.at(0)->connection.use_count(), 1) << "nothing keeps it for an answer";
     ASSERT_FALSE(access.open(marker.in.get()));
+    access.answerWaiting();
 }
 
 TEST_F(EmitterAccessConnections, GetTheDescriptorsWithTheirFrameHoweverMuchIsAheadOfIt)
@@ -252,6 +258,7 @@ TEST_F(EmitterAccessConnections, GetTheDescriptorsWithTheirFrameHoweverMuchIsAhe
     client.waitForSomethingToRead();
     client.write(request(4));
     ASSERT_FALSE(access.open(marker.in.get()));
+    access.answerWaiting();
     const Received received = receive(client, 4);
     EXPECT_THAT(received.numbers, ElementsAre(1, 2, 3, 4));
     EXPECT_EQ(received.descriptors.size(), 2U);

@@ -12,6 +12,7 @@
 #include <atomic>
 #include <csignal>
 #include <deque>
+#include <future>
 #include <gmock/gmock.h>
 #include <map>
 #include <sys/file.h>
@@ -219,6 +220,20 @@ TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherATraceRuns)
     EXPECT_EQ(markers(), "");
     EXPECT_TRUE(one.waitForCompletion());
     EXPECT_TRUE(two.waitForCompletion());
+}
+
+TEST_F(TracefsKernelTraceTest, CanBeUsedByAnEmitterThatIsAnswered)
+{
+    std::vector<bool> areInTime;
+    std::future<bool> use;
+    access.ask(this, [&](const EmitterDescriptors&) {
+        // On another thread, so that a lock that is held makes the test fail and does not let it hang.
+        use = std::async(std::launch::async, [this] { return trace.createTraceSession() != nullptr; });
+        areInTime.push_back(use.wait_for(patience) == std::future_status::ready);
+    });
+    EXPECT_TRUE(trace.isAvailable());
+    ASSERT_THAT(areInTime, ElementsAre(true));
+    EXPECT_TRUE(use.get());
 }
 
 TEST_F(TracefsKernelTraceTest, CompletesASessionThatCouldNotBeStarted)
