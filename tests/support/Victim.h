@@ -13,8 +13,12 @@ namespace support {
 // Make it before the test starts threads, because the process is a fork of the test's.
 class Victim {
 public:
+    struct Unawaited { };
+
     // `act` returns whether it succeeded, which is expected.
-    explicit Victim(const std::function<bool()>& act)
+    explicit Victim(const std::function<bool()>& act) : Victim(Unawaited(), act) { expectSuccess(); }
+    // Does not wait until the action is done.
+    Victim(Unawaited, const std::function<bool()>& act)
     {
         std::array<int, 2> ends{};
         EXPECT_EQ(::pipe(ends.data()), 0);
@@ -26,15 +30,23 @@ public:
             ::_exit(1);
         }
         ::close(ends[1]);
-        char outcome = 0;
-        EXPECT_EQ(::read(ends[0], &outcome, 1), 1);
-        EXPECT_EQ(outcome, 'y');
-        ::close(ends[0]);
+        outcome_ = ends[0];
     }
-    ~Victim() { kill(); }
+    ~Victim()
+    {
+        kill();
+        ::close(outcome_);
+    }
     Victim(const Victim&) = delete;
     Victim& operator=(const Victim&) = delete;
 
+    // Waits until the action is done.
+    void expectSuccess() const
+    {
+        char outcome = 0;
+        EXPECT_EQ(::read(outcome_, &outcome, 1), 1);
+        EXPECT_EQ(outcome, 'y');
+    }
     // Kills it with SIGKILL and waits for its end.
     void kill()
     {
@@ -47,6 +59,7 @@ public:
 
 private:
     pid_t process_ = 0;
+    int outcome_ = -1;
 };
 
 } // namespace support

@@ -34,7 +34,8 @@ FileDescriptor openOwn(int parent, const std::string& name)
 
 class Clearance {
 public:
-    explicit Clearance(int driverFolder) : driver_(driverFolder) { }
+    // `aside` is a name of hidden files that only this publisher uses.
+    Clearance(int driverFolder, std::string aside) : driver_(driverFolder), aside_(std::move(aside)) { }
 
     void run()
     {
@@ -42,8 +43,8 @@ public:
         for (const std::string& name : names)
             clearGroup(name);
         for (const std::string& name : names) // last, because the other files are recognised by them
-            if (isGone(platform::ownerOfChannelOwnerFile(name)))
-                remove(driver_, name);
+            if (isGone(platform::ownerOfChannelOwnerFile(name)) && isOwn(driver_, name))
+                ::unlinkat(driver_, name.c_str(), 0);
     }
 
 private:
@@ -63,12 +64,20 @@ private:
         const FileDescriptor subgroup = openOwn(group, name);
         bool isClearer = false;
         for (const std::string& file : subgroup ? namesIn(subgroup.get()) : std::vector<std::string>())
-            if (isGone(file.starts_with('.') ? platform::ownerOfChannelTemporaryFile(file)
-                                             : ownerOfChannel(subgroup.get(), file)))
-                isClearer = remove(subgroup.get(), file) || isClearer;
+            isClearer = clearFile(subgroup.get(), file) || isClearer;
         if (isClearer)
             ::unlinkat(group, name.c_str(), AT_REMOVEDIR);
         return isClearer;
+    }
+
+    // A living publisher may put its channel in the place of a dead one's at any moment.
+    bool clearFile(int folder, const std::string& name)
+    {
+        return platform::removeFileAtIf(folder, name, aside_, [&](const std::string& file) {
+            const bool isUnfinished = name.starts_with('.');
+            return isOwn(folder, file)
+                && isGone(isUnfinished ? platform::ownerOfChannelTemporaryFile(name) : ownerOfChannel(folder, file));
+        });
     }
 
     // Valid until the next call.
@@ -89,16 +98,17 @@ private:
         return owners_.emplace(owner, platform::isChannelOwnerGone(driver_, owner)).first->second;
     }
 
-    static bool remove(int folder, const std::string& name)
+    static bool isOwn(int folder, const std::string& name)
     {
         struct stat status = {};
         return ::fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(status.st_mode)
-            && status.st_uid == ::geteuid() && ::unlinkat(folder, name.c_str(), 0) == 0;
+            && status.st_uid == ::geteuid();
     }
 
     static constexpr std::size_t longestLine = 64;
 
     const int driver_;
+    const std::string aside_;
     std::string text_;
     std::map<std::string, bool, std::less<>> owners_; // whether each has ended
 };
@@ -124,7 +134,7 @@ void DriverClaim::renew(int driverFolder)
     file_ = platform::makeChannelOwnerFile(driverFolder, owner_);
     folder_ = FileDescriptor(::fcntl(driverFolder, F_DUPFD_CLOEXEC, 0));
     line_ = file_ ? platform::channelOwnerLine(owner_) : std::string();
-    Clearance(driverFolder).run();
+    Clearance(driverFolder, platform::channelTemporaryFileName(owner_)).run();
 }
 
 bool DriverClaim::holds(int driverFolder) const noexcept

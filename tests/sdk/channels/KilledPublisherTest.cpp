@@ -23,6 +23,27 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::UnorderedElementsAre;
 
+// Processes that pass it go on at the same moment.
+class Barrier {
+public:
+    Barrier() { EXPECT_EQ(::pipe(ends_.data()), 0); }
+    ~Barrier() { ::close(ends_[0]); }
+    Barrier(const Barrier&) = delete;
+    Barrier& operator=(const Barrier&) = delete;
+
+    // Waits until it is open. Call it once in a forked process.
+    [[nodiscard]] bool pass() const
+    {
+        char byte = 0;
+        return ::close(ends_[1]) == 0 && ::read(ends_[0], &byte, 1) == 0;
+    }
+    // Call it once, in the process that made it.
+    void open() const { EXPECT_EQ(::close(ends_[1]), 0); }
+
+private:
+    std::array<int, 2> ends_{};
+};
+
 class KilledPublisherTest : public testing::Test {
 protected:
     KilledPublisherTest() { fs::create_directory(root); }
@@ -169,6 +190,29 @@ TEST_F(KilledPublisherTest, LivesInAnotherNamespaceOfProcessesToo)
     if (WEXITSTATUS(status) == 2)
         GTEST_SKIP() << "there can be no other here";
     EXPECT_EQ(status, 0);
+}
+
+TEST_F(KilledPublisherTest, TwoPublishersThatFollowAtTheSameMomentBothHaveTheirChannels)
+{
+    constexpr int rounds = 100;
+    const std::vector<std::array<std::string, 3>> left{{"Tx", "", "a"}, {"Tx", "", "b"}};
+    const std::vector<std::array<std::string, 3>> right{{"Tx", "", "c"}, {"Rx", "", "d"}};
+    std::vector<std::array<std::string, 3>> all = left;
+    all.insert(all.end(), right.begin(), right.end());
+    for (int round = 0; round < rounds && !HasFailure(); ++round) {
+        publisher(all).kill();
+        const Barrier barrier;
+        const Victim one(Victim::Unawaited(), [&] { return barrier.pass() && publish(left); });
+        const Victim other(Victim::Unawaited(), [&] { return barrier.pass() && publish(right); });
+        barrier.open();
+        one.expectSuccess();
+        other.expectSuccess();
+        EXPECT_THAT(channels(), UnorderedElementsAre("a", "b", "c", "d")) << "in round " << round;
+        EXPECT_THAT(files(),
+                    UnorderedElementsAre("amp/Tx/-/a", "amp/Tx/-/b", "amp/Tx/-/c", "amp/Rx/-/d",
+                                         "amp/.kesto-" + ownerOf(root / "amp/Tx/-/a") + ".owner",
+                                         "amp/.kesto-" + ownerOf(root / "amp/Tx/-/c") + ".owner"));
+    }
 }
 
 // --- the living publisher

@@ -112,6 +112,8 @@ bool isChannelOwnerGone(int driverFolder, std::string_view owner)
         return errno == ENOENT;
     if (!S_ISREG(status.st_mode))
         return true;
+    if ((status.st_mode & S_IROTH) == 0)
+        return false; // its publisher is just making it
     const FileDescriptor file(
         ::openat(driverFolder, name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     struct flock lock = wholeFile(F_RDLCK); // only a write lock conflicts with it

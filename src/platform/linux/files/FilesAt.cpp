@@ -6,6 +6,7 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <cstdio>
 #include <dirent.h>
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -124,6 +125,21 @@ std::error_code writeFileAt(int directory, const std::string& name, std::string_
     if (const int error = writeAll(file.get(), bytes); error != 0)
         return {error, std::generic_category()};
     return ::fsync(file.get()) == 0 ? std::error_code() : systemError();
+}
+
+// The kernel cannot remove a file only if it is a certain one, so the file first gets a name that no other process uses.
+bool removeFileAtIf(int directory, const std::string& name, const std::string& aside,
+                    const std::function<bool(const std::string&)>& isUnwanted)
+{
+    const auto move = [directory](const std::string& from, const std::string& to) {
+        return ::renameat2(directory, from.c_str(), directory, to.c_str(), RENAME_NOREPLACE) == 0;
+    };
+    if (!isUnwanted(name) || !move(name, aside))
+        return false;
+    const bool isRemoved = isUnwanted(aside);
+    if (isRemoved || !move(aside, name)) // it cannot be put back where a newer file has its name
+        ::unlinkat(directory, aside.c_str(), 0);
+    return isRemoved;
 }
 
 std::uint64_t bytesOfFilesIn(int directory)

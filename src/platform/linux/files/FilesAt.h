@@ -9,6 +9,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <expected>
+#include <functional>
 #include <string>
 #include <string_view>
 #include <system_error>
@@ -35,6 +36,13 @@ namespace platform {
 
 // Writes a new file, down to the disk.
 [[nodiscard]] std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes);
+
+// Removes the file of that name if the predicate holds for it; false if it stays. The predicate gets the name of a file in
+// this folder. Other processes may put another file in its place at any time: only a file for which the predicate held
+// is removed. `aside` is a name that this process alone uses. On file systems that cannot rename without replacing
+// (RENAME_NOREPLACE) the file stays.
+[[nodiscard]] bool removeFileAtIf(int directory, const std::string& name, const std::string& aside,
+                                  const std::function<bool(const std::string&)>& isUnwanted);
 
 // The total size of the files in a folder, without subfolders.
 [[nodiscard]] std::uint64_t bytesOfFilesIn(int directory);

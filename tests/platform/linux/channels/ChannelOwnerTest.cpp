@@ -188,6 +188,15 @@ TEST_F(ChannelOwnerTest, TheOwnerFileIsForAllToReadAndForItsOwnerToWrite)
     EXPECT_EQ(fs::file_size(ownerFile), 0U);
 }
 
+TEST_F(ChannelOwnerTest, AnOwnerWhoseFileIsJustBeingMadeIsNotGone)
+{
+    support::writeFile(ownerFile, "");
+    ASSERT_EQ(::chmod(ownerFile.c_str(), 0200), 0); // until it is locked
+    EXPECT_FALSE(isChannelOwnerGone(openDriver("amp").get(), owner));
+    ASSERT_EQ(::chmod(ownerFile.c_str(), 0644), 0);
+    EXPECT_TRUE(isChannelOwnerGone(openDriver("amp").get(), owner));
+}
+
 TEST_F(ChannelOwnerTest, ACopyOfAnOwnerFileIsReplaced)
 {
     support::writeFile(ownerFile, "");

@@ -53,6 +53,46 @@ TEST_F(FilesAtTest, ReadsTheFirstBytesOfAFile)
     EXPECT_EQ(readFileAt(folder.get(), "empty", 10), "");
 }
 
+TEST_F(FilesAtTest, RemovesAFileIfItIsUnwanted)
+{
+    const auto isOld = [&](const std::string& name) { return support::readFile(root / name) == "old"; };
+    support::writeFile(root / "file", "new");
+    EXPECT_FALSE(removeFileAtIf(folder.get(), "file", ".aside", isOld));
+    EXPECT_THAT(*namesIn(folder.get(), 10), ElementsAre("file"));
+    support::writeFile(root / "file", "old");
+    EXPECT_TRUE(removeFileAtIf(folder.get(), "file", ".aside", isOld));
+    EXPECT_THAT(*namesIn(folder.get(), 10), IsEmpty());
+}
+
+TEST_F(FilesAtTest, RemovesNoFileThatTakesThePlaceOfAnUnwantedOne)
+{
+    int asked = 0;
+    const auto isOld = [&](const std::string& name) {
+        const bool isIt = support::readFile(root / name) == "old";
+        if (++asked == 1)
+            support::replaceFile(root / "file", "new");
+        return isIt;
+    };
+    support::writeFile(root / "file", "old");
+    EXPECT_FALSE(removeFileAtIf(folder.get(), "file", ".aside", isOld));
+    EXPECT_THAT(*namesIn(folder.get(), 10), ElementsAre("file"));
+    EXPECT_EQ(support::readFile(root / "file"), "new");
+}
+
+TEST_F(FilesAtTest, KeepsTheNewestOfSeveralFilesThatTakeThePlaceOfAnUnwantedOne)
+{
+    int asked = 0;
+    const auto isOld = [&](const std::string& name) {
+        const bool isIt = support::readFile(root / name) == "old";
+        support::replaceFile(root / "file", ++asked == 1 ? "newer" : "newest");
+        return isIt;
+    };
+    support::writeFile(root / "file", "old");
+    EXPECT_FALSE(removeFileAtIf(folder.get(), "file", ".aside", isOld));
+    EXPECT_THAT(*namesIn(folder.get(), 10), ElementsAre("file"));
+    EXPECT_EQ(support::readFile(root / "file"), "newest");
+}
+
 TEST_F(FilesAtTest, ReadsRegularFilesOnlyAndNeverWaits)
 {
     support::writeFile(root / "secret", "secret");
