@@ -4,6 +4,7 @@
 
 #include "SignalFreeThread.h"
 #include "platform/linux/channels/ChannelOwner.h"
+#include "platform/linux/files/FilesAt.h"
 
 #include <algorithm>
 #include <cerrno>
@@ -31,7 +32,7 @@ int pollTime(ChannelClock::duration pause)
 kesto_publisher::kesto_publisher(Settings settings, platform::FileDescriptor doorbell)
     : process_(::getpid()),
       settings_(std::move(settings)),
-      owner_(platform::randomChannelOwner()),
+      owner_(platform::randomDigits()),
       bell_(std::move(doorbell)),
       refreshed_(ChannelClock::now())
 {

@@ -2,37 +2,21 @@
 #include "platform/linux/channels/ChannelOwner.h"
 
 #include "foundation/text/Format.h"
+#include "platform/linux/files/FilesAt.h"
 
 #include <cerrno>
-#include <cstdint>
 #include <fcntl.h>
-#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 namespace platform {
 namespace {
 
-constexpr std::size_t ownerDigits = 16;
 constexpr std::string_view lineBegin = "owner ";
 constexpr std::string_view lineEnd = "\n";
 constexpr std::string_view nameBegin = ".kesto-";
 constexpr std::string_view ownerFileEnd = ".owner";
 constexpr std::string_view temporaryFileEnd = ".tmp";
-
-bool isOwner(std::string_view text)
-{
-    return text.size() == ownerDigits && text.find_first_not_of("0123456789abcdef") == std::string_view::npos;
-}
-
-// The text between the two if it is an owner; else empty.
-std::string_view ownerBetween(std::string_view begin, std::string_view end, std::string_view text)
-{
-    if (text.size() != begin.size() + ownerDigits + end.size() || !text.starts_with(begin) || !text.ends_with(end))
-        return {};
-    text = text.substr(begin.size(), ownerDigits);
-    return isOwner(text) ? text : std::string_view();
-}
 
 struct flock wholeFile(short type)
 {
@@ -43,14 +27,6 @@ struct flock wholeFile(short type)
 }
 
 } // namespace
-
-std::string randomChannelOwner()
-{
-    std::uint64_t number = 0;
-    if (::getrandom(&number, sizeof number, 0) != sizeof number)
-        number = static_cast<std::uint64_t>(::getpid());
-    return foundation::format("{:016x}", number);
-}
 
 std::string channelOwnerLine(std::string_view owner)
 {
@@ -69,21 +45,21 @@ std::string channelTemporaryFileName(std::string_view owner)
 
 std::string_view takeChannelOwner(std::string_view& text)
 {
-    constexpr std::size_t length = lineBegin.size() + ownerDigits + lineEnd.size();
-    const std::string_view owner = ownerBetween(lineBegin, lineEnd, text.substr(0, length));
+    const std::string_view line = text.substr(0, text.find('\n') + 1);
+    const std::string_view owner = randomDigitsBetween(lineBegin, lineEnd, line);
     if (!owner.empty())
-        text.remove_prefix(length);
+        text.remove_prefix(line.size());
     return owner;
 }
 
 std::string_view ownerOfChannelOwnerFile(std::string_view name)
 {
-    return ownerBetween(nameBegin, ownerFileEnd, name);
+    return randomDigitsBetween(nameBegin, ownerFileEnd, name);
 }
 
 std::string_view ownerOfChannelTemporaryFile(std::string_view name)
 {
-    return ownerBetween(nameBegin, temporaryFileEnd, name);
+    return randomDigitsBetween(nameBegin, temporaryFileEnd, name);
 }
 
 FileDescriptor makeChannelOwnerFile(int driverFolder, std::string_view owner)

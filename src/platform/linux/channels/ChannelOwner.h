@@ -23,9 +23,7 @@
 
 namespace platform {
 
-// All on any thread. An owner is its number, 16 hexadecimal digits; empty means none.
-
-[[nodiscard]] std::string randomChannelOwner();
+// All on any thread. An owner is its number, 16 hexadecimal digits (`randomDigits`); empty means none.
 
 // The first line of a file, and the names of hidden files.
 [[nodiscard]] std::string channelOwnerLine(std::string_view owner);

@@ -1,6 +1,7 @@
 // A thin layer over the kernel's *at calls, which ensures that none of them follows a link.
 #include "platform/linux/files/FilesAt.h"
 
+#include "foundation/text/Format.h"
 #include "platform/linux/files/SystemError.h"
 #include "platform/linux/files/WriteAll.h"
 
@@ -9,7 +10,6 @@
 #include <cstdio>
 #include <dirent.h>
 #include <fcntl.h>
-#include <fmt/format.h>
 #include <limits>
 #include <memory>
 #include <sys/random.h>
@@ -21,6 +21,7 @@ namespace {
 
 constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
 constexpr unsigned deepestTree = 8; // that `removeTreeAt` removes; the service's own are not deeper
+constexpr std::size_t digits = 16;
 constexpr std::string_view temporaryBegin = ".kestod-";
 constexpr std::string_view temporaryEnd = ".tmp";
 
@@ -99,20 +100,30 @@ std::expected<std::string, std::error_code> readFileAt(int directory, const std:
     return bytes;
 }
 
-std::string temporaryName()
+std::string randomDigits()
 {
     std::uint64_t number = 0;
     if (::getrandom(&number, sizeof number, 0) != sizeof number)
         number = static_cast<std::uint64_t>(::getpid());
-    return fmt::format("{}{:016x}{}", temporaryBegin, number, temporaryEnd);
+    return foundation::format("{:016x}", number);
+}
+
+std::string_view randomDigitsBetween(std::string_view begin, std::string_view end, std::string_view text)
+{
+    if (text.size() != begin.size() + digits + end.size() || !text.starts_with(begin) || !text.ends_with(end))
+        return {};
+    text = text.substr(begin.size(), digits);
+    return text.find_first_not_of("0123456789abcdef") == std::string_view::npos ? text : std::string_view();
+}
+
+std::string temporaryName()
+{
+    return foundation::format("{}{}{}", temporaryBegin, randomDigits(), temporaryEnd);
 }
 
 bool isTemporaryName(std::string_view name)
 {
-    constexpr std::size_t digits = 16;
-    return name.size() == temporaryBegin.size() + digits + temporaryEnd.size() && name.starts_with(temporaryBegin)
-        && name.ends_with(temporaryEnd)
-        && name.substr(temporaryBegin.size(), digits).find_first_not_of("0123456789abcdef") == std::string_view::npos;
+    return !randomDigitsBetween(temporaryBegin, temporaryEnd, name).empty();
 }
 
 std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes)
@@ -127,7 +138,8 @@ std::error_code writeFileAt(int directory, const std::string& name, std::string_
     return ::fsync(file.get()) == 0 ? std::error_code() : systemError();
 }
 
-// The kernel cannot remove a file only if it is a certain one, so the file first gets a name that no other process uses.
+// The kernel cannot remove a file only if it is a certain one, so the file first gets a name that no other process
+// uses.
 bool removeFileAtIf(int directory, const std::string& name, const std::string& aside,
                     const std::function<bool(const std::string&)>& isUnwanted)
 {

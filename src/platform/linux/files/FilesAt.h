@@ -29,6 +29,11 @@ namespace platform {
 [[nodiscard]] std::expected<std::string, std::error_code> readFileAt(int directory, const std::string& name,
                                                                      std::size_t most);
 
+// 16 random hexadecimal digits, for names that no other process uses.
+[[nodiscard]] std::string randomDigits();
+// The digits of a text that consists of `begin`, such digits and `end`; empty for other texts.
+[[nodiscard]] std::string_view randomDigitsBetween(std::string_view begin, std::string_view end, std::string_view text);
+
 // A name for an unfinished file: hidden, and random, so that another process cannot take it first.
 [[nodiscard]] std::string temporaryName();
 // Whether it is such a name. A killed process leaves its unfinished files.
@@ -37,9 +42,9 @@ namespace platform {
 // Writes a new file, down to the disk.
 [[nodiscard]] std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes);
 
-// Removes the file of that name if the predicate holds for it; false if it stays. The predicate gets the name of a file in
-// this folder. Other processes may put another file in its place at any time: only a file for which the predicate held
-// is removed. `aside` is a name that this process alone uses. On file systems that cannot rename without replacing
+// Removes the file of that name if the predicate holds for it; false if it stays. The predicate gets the name of a file
+// in this folder. Other processes may put another file in its place at any time: only a file for which the predicate
+// held is removed. `aside` is a name that this process alone uses. On file systems that cannot rename without replacing
 // (RENAME_NOREPLACE) the file stays.
 [[nodiscard]] bool removeFileAtIf(int directory, const std::string& name, const std::string& aside,
                                   const std::function<bool(const std::string&)>& isUnwanted);

@@ -53,6 +53,18 @@ TEST_F(FilesAtTest, ReadsTheFirstBytesOfAFile)
     EXPECT_EQ(readFileAt(folder.get(), "empty", 10), "");
 }
 
+TEST(RandomDigits, AreOthersEachTimeAndFoundInNames)
+{
+    const std::string digits = randomDigits();
+    EXPECT_THAT(digits, testing::MatchesRegex("[0-9a-f]*"));
+    EXPECT_EQ(digits.size(), 16U);
+    EXPECT_NE(digits, randomDigits());
+    EXPECT_EQ(randomDigitsBetween("<", ">", "<" + digits + ">"), digits);
+    for (const char* other : {"", "<>", "<0123456789abcde>", "<0123456789abcdef0>", "<0123456789abcdeF>",
+                              "0123456789abcdef>", "<0123456789abcdef"})
+        EXPECT_EQ(randomDigitsBetween("<", ">", other), "") << other;
+}
+
 TEST_F(FilesAtTest, RemovesAFileIfItIsUnwanted)
 {
     const auto isOld = [&](const std::string& name) { return support::readFile(root / name) == "old"; };
