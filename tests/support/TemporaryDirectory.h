@@ -1,6 +1,7 @@
-// A directory for one test, gone with everything in it when the test is over.
+// A directory for one test, which is removed with everything in it when the test is over; and its files.
 #pragma once
 
+#include <algorithm>
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
@@ -8,6 +9,7 @@
 #include <stdexcept>
 #include <string>
 #include <string_view>
+#include <vector>
 
 namespace support {
 
@@ -53,6 +55,22 @@ inline std::string readFile(const std::filesystem::path& path)
     std::ostringstream text;
     text << std::ifstream(path, std::ios::binary).rdbuf();
     return text.str();
+}
+
+// The sorted names in a folder, hidden ones too.
+inline std::vector<std::string> namesIn(const std::filesystem::path& folder)
+{
+    std::vector<std::string> names;
+    for (const auto& entry : std::filesystem::directory_iterator(folder))
+        names.push_back(entry.path().filename());
+    std::ranges::sort(names);
+    return names;
+}
+
+// Of the file itself, also of a link.
+inline unsigned permissionsOf(const std::filesystem::path& path)
+{
+    return static_cast<unsigned>(std::filesystem::symlink_status(path).permissions());
 }
 
 } // namespace support

@@ -84,14 +84,7 @@ public:
         const fs::file_status status = fs::symlink_status(folder);
         return fs::is_directory(status) ? std::optional(static_cast<unsigned>(status.permissions())) : std::nullopt;
     }
-    [[nodiscard]] std::vector<std::string> namesIn(const fs::path& folder) override
-    {
-        std::vector<std::string> names;
-        for (const auto& entry : fs::directory_iterator(folder))
-            names.push_back(entry.path().filename());
-        std::ranges::sort(names);
-        return names;
-    }
+    [[nodiscard]] std::vector<std::string> namesIn(const fs::path& folder) override { return support::namesIn(folder); }
     [[nodiscard]] std::optional<std::string> textOf(const fs::path& file) override
     {
         return fs::is_regular_file(file) ? std::optional(support::readFile(file)) : std::nullopt;

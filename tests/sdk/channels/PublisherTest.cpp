@@ -20,6 +20,8 @@ namespace {
 namespace fs = std::filesystem;
 using kesto::Status;
 using std::chrono::milliseconds;
+using support::namesIn;
+using support::permissionsOf;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
@@ -48,20 +50,6 @@ protected:
         while (value() != expected && std::chrono::steady_clock::now() < end)
             std::this_thread::yield();
         return value() == expected;
-    }
-    // The names in a folder, hidden files too.
-    static std::vector<std::string> namesIn(const fs::path& folder)
-    {
-        std::vector<std::string> names;
-        for (const auto& entry : fs::directory_iterator(folder))
-            names.push_back(entry.path().filename());
-        return names;
-    }
-    static unsigned permissionsOf(const fs::path& path)
-    {
-        struct stat status = {};
-        EXPECT_EQ(::lstat(path.c_str(), &status), 0) << path;
-        return status.st_mode & 07777U;
     }
 
     const support::TemporaryDirectory directory;

@@ -3,7 +3,6 @@
 
 #include "support/TemporaryDirectory.h"
 
-#include <algorithm>
 #include <array>
 #include <csignal>
 #include <gmock/gmock.h>
@@ -16,6 +15,7 @@ namespace platform {
 namespace {
 
 namespace fs = std::filesystem;
+using support::namesIn;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::UnorderedElementsAre;
@@ -26,15 +26,6 @@ using Limits = BugCaptureFolder::Limits;
 
 class BugCaptureFolderTest : public testing::Test {
 protected:
-    static std::vector<std::string> namesIn(const fs::path& path)
-    {
-        std::vector<std::string> names;
-        std::error_code missing;
-        for (const auto& entry : fs::directory_iterator(path, missing))
-            names.push_back(entry.path().filename());
-        std::ranges::sort(names);
-        return names;
-    }
     static std::error_code addTo(BugCaptureFolder& folder, const std::string& bulk = "bulk")
     {
         const auto name = folder.nextName(noon);

@@ -44,14 +44,7 @@ protected:
         make("note-" + std::to_string(number), number, size);
         files.keepWithin(folder, kept, size);
     }
-    [[nodiscard]] std::vector<std::string> names() const
-    {
-        std::vector<std::string> names;
-        for (const auto& entry : fs::directory_iterator(folder))
-            names.push_back(entry.path().filename());
-        std::ranges::sort(names);
-        return names;
-    }
+    [[nodiscard]] std::vector<std::string> names() const { return support::namesIn(folder); }
 
     // In a process of its own, which owns the files and may read the folder, but not write to it.
     template <typename Body> [[nodiscard]] bool isTrueWithoutRightToRemove(Body body) const

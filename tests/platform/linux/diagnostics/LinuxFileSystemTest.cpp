@@ -16,6 +16,8 @@ namespace {
 
 namespace fs = std::filesystem;
 using platform::LinuxFileSystem;
+using support::namesIn;
+using support::permissionsOf;
 using testing::Each;
 using testing::ElementsAre;
 using testing::IsEmpty;
@@ -23,20 +25,6 @@ using testing::UnorderedElementsAre;
 
 class LinuxFileSystemTest : public testing::Test {
 protected:
-    // The names in a folder, hidden files too.
-    static std::vector<std::string> namesIn(const fs::path& path)
-    {
-        std::vector<std::string> names;
-        for (const auto& entry : fs::directory_iterator(path))
-            names.push_back(entry.path().filename());
-        return names;
-    }
-    static unsigned permissionsOf(const fs::path& path)
-    {
-        struct stat status = {};
-        EXPECT_EQ(::lstat(path.c_str(), &status), 0) << path;
-        return status.st_mode & 07777U;
-    }
     std::expected<void, std::error_code> write(const fs::path& path, std::string_view text)
     {
         auto file = files.createAtomically(path);

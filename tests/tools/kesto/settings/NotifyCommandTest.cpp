@@ -14,14 +14,6 @@ namespace {
 using testing::HasSubstr;
 using testing::IsEmpty;
 
-std::vector<std::string> namesIn(const std::filesystem::path& directory)
-{
-    std::vector<std::string> names;
-    for (const auto& entry : std::filesystem::directory_iterator(directory))
-        names.push_back(entry.path().filename());
-    return names;
-}
-
 class NotifyCommand : public testing::Test {
 protected:
     const support::TemporaryDirectory directory;
@@ -39,7 +31,7 @@ TEST_F(NotifyCommand, WritesTheStateForAllToRead)
     EXPECT_EQ(std::filesystem::status(file.parent_path()).permissions(), std::filesystem::perms(0755));
     EXPECT_EQ(tool.print({"notify", "com.quarn.halden.ringerstate", "18446744073709551615"}), "");
     EXPECT_EQ(support::readFile(file), "18446744073709551615\n");
-    EXPECT_EQ(namesIn(file.parent_path()).size(), 1U) << "and nothing is left behind";
+    EXPECT_EQ(support::namesIn(file.parent_path()).size(), 1U) << "and nothing is left behind";
 }
 
 TEST_F(NotifyCommand, KeepsTheStateWhenItIsGivenNone)

@@ -77,13 +77,7 @@ protected:
         static_cast<void>(record({}, {"true"}));
         return !kestod.log().contains("the kernel trace is not available: ");
     }
-    [[nodiscard]] std::vector<std::string> namesInTraces() const
-    {
-        std::vector<std::string> names;
-        for (const auto& entry : std::filesystem::directory_iterator(path("logs/Audio/Traces")))
-            names.push_back(entry.path().filename());
-        return names;
-    }
+    [[nodiscard]] std::vector<std::string> namesInTraces() const { return support::namesIn(path("logs/Audio/Traces")); }
 
     const support::RealTracefs tracefs; // before the service, which must find it
     end_to_end::Kestod kestod;
