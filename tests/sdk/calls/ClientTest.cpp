@@ -1,14 +1,12 @@
 // A client and a service on a real socket: every operation, its answers, and the ends that a client can have.
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"
-#include "sdk/Recorder.h"
-#include "support/TemporaryDirectory.h"
+#include "sdk/ServedClientTest.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <limits>
 #include <memory>
-#include <optional>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -24,40 +22,23 @@ using kesto::Group;
 using kesto::ServiceType;
 using kesto::State;
 using kesto::Status;
-using sdk_test::Answers;
 using sdk_test::FakeService;
 using sdk_test::patience;
 using sdk_test::Peer;
-using sdk_test::States;
 using testing::Each;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
 constexpr std::chrono::milliseconds longEnough = patience;
 
-class ClientTest : public testing::Test {
+class ClientTest : public sdk_test::ServedClientTest {
 protected:
-    kesto::Options options()
-    {
-        kesto::Options options;
-        options.socketPath = path_;
-        options.stateChanged = states_.callback();
-        return options;
-    }
-
     // A client of a service that answers like this.
     void connect(FakeService::Handler handler = sdk_test::answerObediently)
     {
         service_.emplace(path_, std::move(handler));
         ASSERT_EQ(client_.open(options()), Status::Ok);
     }
-
-    support::TemporaryDirectory directory_;
-    const std::string path_ = directory_ / "service";
-    std::optional<FakeService> service_;
-    Answers answers_;
-    States states_;
-    kesto::Client client_; // its callbacks use what stands above
 };
 
 TEST_F(ClientTest, SendsEveryOperationAsTheProtocolHasIt)

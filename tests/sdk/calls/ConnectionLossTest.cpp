@@ -1,12 +1,11 @@
 // What becomes of calls, sessions and clients when the service goes, was never there, or talks nonsense.
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"
-#include "sdk/Recorder.h"
+#include "sdk/ServedClientTest.h"
 #include "support/TemporaryDirectory.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
-#include <optional>
 #include <rapidcheck/gtest.h>
 
 namespace {
@@ -20,24 +19,21 @@ using kesto::Status;
 using sdk_test::Answers;
 using sdk_test::FakeService;
 using sdk_test::Peer;
-using sdk_test::States;
 using testing::ElementsAre;
 using testing::UnorderedElementsAre;
 
 constexpr std::chrono::milliseconds longEnough = sdk_test::patience;
 const std::string lost = ": the connection to the service was lost";
 
-class ConnectionLossTest : public testing::Test {
+class ConnectionLossTest : public sdk_test::ServedClientTest {
 protected:
     void open(bool reconnect)
     {
-        kesto::Options options;
-        options.socketPath = path_;
-        options.reconnect = reconnect;
-        options.firstRetry = std::chrono::milliseconds(1);
-        options.longestRetry = std::chrono::milliseconds(20);
-        options.stateChanged = states_.callback();
-        ASSERT_EQ(client_.open(options), Status::Ok);
+        kesto::Options retrying = options();
+        retrying.reconnect = reconnect;
+        retrying.firstRetry = std::chrono::milliseconds(1);
+        retrying.longestRetry = std::chrono::milliseconds(20);
+        ASSERT_EQ(client_.open(retrying), Status::Ok);
     }
 
     Status send(kesto::AnswerCallback callback = nullptr)
@@ -45,13 +41,6 @@ protected:
         kesto::Message message;
         return client_.send(message, Category::Playback, EventType::Start, 42, std::move(callback));
     }
-
-    support::TemporaryDirectory directory_;
-    const std::string path_ = directory_ / "service";
-    std::optional<FakeService> service_;
-    Answers answers_;
-    States states_;
-    kesto::Client client_;
 };
 
 TEST_F(ConnectionLossTest, AnswersEverythingUnansweredOnceAndTellsTheStateAfterThat)

@@ -2,7 +2,7 @@
 #include "kesto/kesto.hpp"
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
-#include "sdk/Recorder.h"
+#include "sdk/ServedClientTest.h"
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
 
@@ -35,12 +35,11 @@ using kesto::EventType;
 using kesto::Status;
 using sdk_test::Answers;
 using sdk_test::FakeService;
-using sdk_test::States;
 using testing::ElementsAre;
 
 constexpr std::chrono::milliseconds longEnough = sdk_test::patience;
 
-class SendTest : public testing::Test {
+class SendTest : public sdk_test::ServedClientTest {
 protected:
     void connect(FakeService::Handler handler = sdk_test::answerObediently, kesto::Options options = {})
     {
@@ -66,13 +65,6 @@ protected:
             ++taken;
         }
     }
-
-    support::TemporaryDirectory directory_;
-    const std::string path_ = directory_ / "service";
-    std::optional<FakeService> service_;
-    Answers answers_;
-    States states_;
-    kesto::Client client_;
 };
 
 TEST_F(SendTest, CountsWhatBecameOfEveryMessage)
