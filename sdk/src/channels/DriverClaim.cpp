@@ -43,7 +43,7 @@ public:
         for (const std::string& name : names)
             clearGroup(name);
         for (const std::string& name : names) // last, because the other files are recognised by them
-            if (isGone(platform::ownerOfChannelOwnerFile(name)) && isOwn(driver_, name))
+            if (isGone(platform::ownerOfChannelOwnerFile(name)) && platform::isOwnFileAt(driver_, name))
                 ::unlinkat(driver_, name.c_str(), 0);
     }
 
@@ -75,7 +75,7 @@ private:
     {
         return platform::removeFileAtIf(folder, name, aside_, [&](const std::string& file) {
             const bool isUnfinished = name.starts_with('.');
-            return isOwn(folder, file)
+            return platform::isOwnFileAt(folder, file)
                 && isGone(isUnfinished ? platform::ownerOfChannelTemporaryFile(name) : ownerOfChannel(folder, file));
         });
     }
@@ -96,13 +96,6 @@ private:
         if (known != owners_.end())
             return known->second;
         return owners_.emplace(owner, platform::isChannelOwnerGone(driver_, owner)).first->second;
-    }
-
-    static bool isOwn(int folder, const std::string& name)
-    {
-        struct stat status = {};
-        return ::fstatat(folder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(status.st_mode)
-            && status.st_uid == ::geteuid();
     }
 
     static constexpr std::size_t longestLine = 64;

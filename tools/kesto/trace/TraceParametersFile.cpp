@@ -5,11 +5,14 @@
 #include "kesto/Terminal.h"
 #include "kesto/files/InputFile.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
+#include "platform/linux/files/FilesAt.h"
+#include "platform/linux/files/LockedFile.h"
+#include "platform/linux/files/WriteAll.h"
 #include "tracing/TraceParamsParser.h"
 
 #include <algorithm>
+#include <cerrno>
 #include <fmt/format.h>
-#include <random>
 #include <stdexcept>
 #include <system_error>
 #include <unistd.h>
@@ -32,10 +35,13 @@ std::string whyNeverMeasured(const TraceDataParams& point)
     return point.beginCode == point.endCode ? "it begins and ends with one code" : "";
 }
 
-fs::path pathOfCopy(const fs::path& folder)
+constexpr std::string_view copyBegin = ".kesto-";
+constexpr std::string_view copyEnd = ".plist";
+
+bool isLeftCopy(int folder, const std::string& name)
 {
-    std::random_device random;
-    return folder / fmt::format(".kesto-{:08x}{:08x}.plist", random(), random());
+    return !platform::randomDigitsBetween(copyBegin, copyEnd, name).empty() && platform::isOwnFileAt(folder, name)
+        && platform::isMakerGoneAt(folder, name);
 }
 
 } // namespace
@@ -80,21 +86,38 @@ std::vector<std::string> warningsOf(const TraceParams& params)
     return warnings;
 }
 
-TraceParametersCopy::TraceParametersCopy(const fs::path& root, const fs::path& folder, std::string_view text)
-    : path_(pathOfCopy(folder))
+void removeLeftTraceParametersCopies(const fs::path& root, const fs::path& folder)
 {
-    const auto fail = [this](const std::error_code& error) {
-        throw std::runtime_error(fmt::format("cannot write {}: {}", printable(path_.native()), error.message()));
+    constexpr std::size_t mostNames = 100'000; // other users may make files there
+    const auto opened = platform::LinuxFileSystem(root).openDirectory(folder);
+    const auto names = opened ? platform::namesIn(opened->get(), mostNames) : std::unexpected(opened.error());
+    for (const std::string& name : names.value_or(std::vector<std::string>()))
+        if (isLeftCopy(opened->get(), name))
+            ::unlinkat(opened->get(), name.c_str(), 0);
+}
+
+TraceParametersCopy::TraceParametersCopy(const fs::path& root, const fs::path& folder, std::string_view text)
+    : name_(fmt::format("{}{}{}", copyBegin, platform::randomDigits(), copyEnd)),
+      path_(folder / name_)
+{
+    const auto fail = [this](int error) {
+        throw std::runtime_error(
+            fmt::format("cannot write {}: {}", printable(path_.native()), std::generic_category().message(error)));
     };
-    auto file = platform::LinuxFileSystem(root).createAtomically(path_);
-    if (!file)
-        fail(file.error());
-    (*file)->write(text);
-    if (const auto written = (*file)->commit(); !written)
-        fail(written.error());
+    auto opened = platform::LinuxFileSystem(root).openDirectory(folder);
+    if (!opened)
+        fail(opened.error().value());
+    folder_ = *std::move(opened);
+    file_ = platform::makeLockedFileAt(folder_.get(), name_);
+    if (!file_)
+        fail(errno);
+    if (const int error = platform::writeAll(file_.get(), text); error != 0) {
+        ::unlinkat(folder_.get(), name_.c_str(), 0);
+        fail(error);
+    }
 }
 
 TraceParametersCopy::~TraceParametersCopy()
 {
-    ::unlink(path_.c_str());
+    ::unlinkat(folder_.get(), name_.c_str(), 0);
 }

@@ -2,6 +2,7 @@
 // and makes a copy for a service that cannot read the file.
 #pragma once
 
+#include "platform/linux/files/FileDescriptor.h"
 #include "tracing/TraceParams.h"
 
 #include <filesystem>
@@ -24,7 +25,7 @@ struct TraceParametersFile {
 
 // A copy that the service can read, even if it cannot read the file itself. It is in the service's folder of results:
 // the service can reach it, and all users who may read the results may write there. The copy lasts as long as this
-// object.
+// object; a killed process leaves it.
 class TraceParametersCopy {
 public:
     // Makes the copy in the folder, which is at or below the root. Below the root it does not follow links, because
@@ -37,5 +38,11 @@ public:
     [[nodiscard]] const std::filesystem::path& path() const { return path_; }
 
 private:
+    const std::string name_;
     const std::filesystem::path path_;
+    platform::FileDescriptor folder_;
+    platform::FileDescriptor file_; // locked as long as the copy is needed
 };
+
+// Removes this user's copies whose processes have ended. Other files stay, and so does what cannot be removed.
+void removeLeftTraceParametersCopies(const std::filesystem::path& root, const std::filesystem::path& folder);

@@ -170,6 +170,7 @@ int recordTrace(const TraceRecordingOptions& options)
     for (const std::string& warning : warningsOf(parameters.params))
         fmt::print(stderr, "kesto: warning: {}: {}\n", printable(parameters.path.native()), printable(warning));
     const ResultsFolder folder = folderOf(options);
+    removeLeftTraceParametersCopies(folder.root, folder.path);
     TraceResultsPlace results(options.results.empty() ? folder.path / "tracing_results.qdj" : options.results);
     if (!options.socket.empty())
         ::setenv("KESTO_SOCKET", options.socket.c_str(), 1); // before threads start

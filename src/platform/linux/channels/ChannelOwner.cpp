@@ -1,12 +1,10 @@
-// An owner file is not accessible to other users until it is locked, so that no other process can lock it first.
+// All texts are one prefix, the owner and one suffix.
 #include "platform/linux/channels/ChannelOwner.h"
 
 #include "foundation/text/Format.h"
 #include "platform/linux/files/FilesAt.h"
+#include "platform/linux/files/LockedFile.h"
 
-#include <cerrno>
-#include <fcntl.h>
-#include <sys/stat.h>
 #include <unistd.h>
 
 namespace platform {
@@ -17,14 +15,6 @@ constexpr std::string_view lineEnd = "\n";
 constexpr std::string_view nameBegin = ".kesto-";
 constexpr std::string_view ownerFileEnd = ".owner";
 constexpr std::string_view temporaryFileEnd = ".tmp";
-
-struct flock wholeFile(short type)
-{
-    struct flock lock = {};
-    lock.l_type = type;
-    lock.l_whence = SEEK_SET;
-    return lock;
-}
 
 } // namespace
 
@@ -64,36 +54,14 @@ std::string_view ownerOfChannelTemporaryFile(std::string_view name)
 
 FileDescriptor makeChannelOwnerFile(int driverFolder, std::string_view owner)
 {
-    constexpr mode_t nobodyElse = 0200;
-    constexpr mode_t everybody = 0644;
     const std::string name = channelOwnerFileName(owner);
     ::unlinkat(driverFolder, name.c_str(), 0); // another process had made a file of that name
-    FileDescriptor file(
-        ::openat(driverFolder, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, nobodyElse));
-    struct flock lock = wholeFile(F_WRLCK);
-    if (file && (::fcntl(file.get(), F_OFD_SETLK, &lock) != 0 || ::fchmod(file.get(), everybody) != 0)) {
-        const int error = errno;
-        ::unlinkat(driverFolder, name.c_str(), 0);
-        file = FileDescriptor();
-        errno = error;
-    }
-    return file;
+    return makeLockedFileAt(driverFolder, name);
 }
 
 bool isChannelOwnerGone(int driverFolder, std::string_view owner)
 {
-    const std::string name = channelOwnerFileName(owner);
-    struct stat status = {};
-    if (::fstatat(driverFolder, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) != 0)
-        return errno == ENOENT;
-    if (!S_ISREG(status.st_mode))
-        return true;
-    if ((status.st_mode & S_IROTH) == 0)
-        return false; // its publisher is just making it
-    const FileDescriptor file(
-        ::openat(driverFolder, name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    struct flock lock = wholeFile(F_RDLCK); // only a write lock conflicts with it
-    return file && ::fcntl(file.get(), F_OFD_GETLK, &lock) == 0 && lock.l_type == F_UNLCK;
+    return isMakerGoneAt(driverFolder, channelOwnerFileName(owner));
 }
 
 } // namespace platform

@@ -5,13 +5,7 @@
 //     <root>/<driver>/<group>/<subgroup>/.kesto-0123456789abcdef.tmp       an unfinished file
 //
 // A publisher writes a random number, its owner, to the first line of every file, and holds a lock on the owner file of
-// that name. The kernel releases the lock when the process ends, for any reason. So process IDs, which are used again
-// and differ between namespaces, are not needed. If a file's owner file is missing or not locked, the publisher has
-// ended.
-//
-// It is a write lock on the open file (F_OFD_SETLK): only users who may write the file can hold it, so no other user
-// can pretend that an owner lives; and testing the lock does not disturb it. A forked child holds it together with its
-// parent, until the child ends or executes another program.
+// that name (LockedFile.h). If a file's owner file is missing or not locked, the publisher has ended.
 //
 // A file without an owner comes from a simpler writer. It counts as long as it exists.
 #pragma once

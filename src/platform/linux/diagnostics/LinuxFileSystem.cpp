@@ -144,7 +144,7 @@ std::expected<std::unique_ptr<AtomicFile>, std::error_code>
 LinuxFileSystem::createAtomically(const std::filesystem::path& path)
 {
     constexpr mode_t readableByAll = 0644;
-    auto directory = openDirectory(path.parent_path(), std::nullopt);
+    auto directory = openDirectory(path.parent_path());
     if (!directory)
         return std::unexpected(directory.error());
     std::string name = temporaryName();
@@ -159,12 +159,12 @@ LinuxFileSystem::createAtomically(const std::filesystem::path& path)
 void LinuxFileSystem::keepWithin(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes)
 {
     if (keeper_ != nullptr)
-        keeper_->added(folder, kept, bytes, [this, folder] { return openDirectory(folder, std::nullopt); });
+        keeper_->added(folder, kept, bytes, [this, folder] { return openDirectory(folder); });
 }
 
 void LinuxFileSystem::removeUnfinished(const std::filesystem::path& folder)
 {
-    const auto opened = openDirectory(folder, std::nullopt);
+    const auto opened = openDirectory(folder);
     if (opened && keeper_ != nullptr)
         keeper_->removeUnfinished(folder, opened->get());
 }

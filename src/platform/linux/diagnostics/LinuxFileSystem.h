@@ -39,6 +39,12 @@ public:
     [[nodiscard]] std::expected<std::string, std::error_code> readFile(const std::filesystem::path& path,
                                                                        std::size_t limit) override;
 
+    // Opens a folder, which is the root or below it.
+    [[nodiscard]] std::expected<FileDescriptor, std::error_code> openDirectory(const std::filesystem::path& path) const
+    {
+        return openDirectory(path, std::nullopt);
+    }
+
     // Removes the unfinished files of a killed service from the folder. Call it at the start, before anything is
     // written. A missing folder counts as empty.
     void removeUnfinished(const std::filesystem::path& folder);

@@ -138,6 +138,13 @@ std::error_code writeFileAt(int directory, const std::string& name, std::string_
     return ::fsync(file.get()) == 0 ? std::error_code() : systemError();
 }
 
+bool isOwnFileAt(int directory, const std::string& name)
+{
+    struct stat status = {};
+    return ::fstatat(directory, name.c_str(), &status, AT_SYMLINK_NOFOLLOW) == 0 && S_ISREG(status.st_mode)
+        && status.st_uid == ::geteuid();
+}
+
 // The kernel cannot remove a file only if it is a certain one, so the file first gets a name that no other process
 // uses.
 bool removeFileAtIf(int directory, const std::string& name, const std::string& aside,

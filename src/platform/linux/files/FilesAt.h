@@ -42,6 +42,9 @@ namespace platform {
 // Writes a new file, down to the disk.
 [[nodiscard]] std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes);
 
+// Whether it is a regular file of this process's user.
+[[nodiscard]] bool isOwnFileAt(int directory, const std::string& name);
+
 // Removes the file of that name if the predicate holds for it; false if it stays. The predicate gets the name of a file
 // in this folder. Other processes may put another file in its place at any time: only a file for which the predicate
 // held is removed. `aside` is a name that this process alone uses. On file systems that cannot rename without replacing

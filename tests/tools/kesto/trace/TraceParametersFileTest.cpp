@@ -2,10 +2,13 @@
 #include "kesto/trace/TraceParametersFile.h"
 
 #include "support/TemporaryDirectory.h"
+#include "support/Victim.h"
 
 #include <filesystem>
 #include <gmock/gmock.h>
+#include <optional>
 #include <sys/stat.h>
+#include <unistd.h>
 
 namespace {
 
@@ -103,6 +106,44 @@ TEST_F(TraceParametersCopyTest, IsNotMadeBehindALinkThatOthersPutThere)
         EXPECT_THAT(error.what(), testing::EndsWith(".plist: Not a directory"));
     }
     EXPECT_TRUE(fs::is_empty(root / "elsewhere"));
+}
+
+TEST_F(TraceParametersCopyTest, IsRemovedLaterIfItsProcessWasKilled)
+{
+    const auto makeCopy = [this] {
+        static std::optional<TraceParametersCopy> copy; // of the process that runs this function
+        copy.emplace(root.path(), folder, "text");
+        return true;
+    };
+    support::Victim killed(makeCopy);
+    const auto left = support::namesIn(folder);
+    const support::Victim living(makeCopy);
+    const TraceParametersCopy own(root.path(), folder, "text");
+    auto expected = support::namesIn(folder);
+    ASSERT_THAT(expected, testing::SizeIs(3));
+    removeLeftTraceParametersCopies(root.path(), folder);
+    EXPECT_EQ(support::namesIn(folder), expected);
+    killed.kill();
+    EXPECT_EQ(support::namesIn(folder), expected) << "until the next recording";
+    removeLeftTraceParametersCopies(root.path(), folder);
+    std::erase(expected, left.at(0));
+    EXPECT_EQ(support::namesIn(folder), expected);
+}
+
+TEST_F(TraceParametersCopyTest, NothingElseIsRemoved)
+{
+    constexpr uid_t nobody = 65534;
+    for (const char* name : {".kesto-0.plist", ".kesto-0123456789abcdef.tmp", "0123456789abcdef.plist"})
+        support::writeFile(folder / name, "");
+    fs::create_directory(folder / ".kesto-1111111111111111.plist");
+    fs::create_symlink(".kesto-0.plist", folder / ".kesto-2222222222222222.plist");
+    support::writeFile(folder / ".kesto-3333333333333333.plist", "");
+    if (::chown((folder / ".kesto-3333333333333333.plist").c_str(), nobody, nobody) != 0)
+        fs::remove(folder / ".kesto-3333333333333333.plist"); // only root can give files away
+    const auto before = support::namesIn(folder);
+    removeLeftTraceParametersCopies(root.path(), folder);
+    EXPECT_EQ(support::namesIn(folder), before);
+    removeLeftTraceParametersCopies(root.path(), root / "missing");
 }
 
 TEST_F(TraceParametersCopyTest, MayLieInTheRootItself)

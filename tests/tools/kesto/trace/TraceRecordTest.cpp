@@ -127,6 +127,15 @@ TEST_F(TraceRecord, MeasuresByAFileThatTheServiceCannotRead)
     EXPECT_THAT(namesInTraces(), ElementsAre("tracing_results.qdj")) << "the copy is gone";
 }
 
+TEST_F(TraceRecord, RemovesTheCopyOfAKilledRecording)
+{
+    const std::string left = path("logs/Audio/Traces/.kesto-0123456789abcdef.plist");
+    std::filesystem::create_directories(path("logs/Audio/Traces"));
+    support::writeFile(left, "copy");
+    expectNothingIsRun(record({}, {"touch", path("touched")}), "");
+    EXPECT_FALSE(std::filesystem::exists(left));
+}
+
 TEST_F(TraceRecord, DoesNotRunTheProgramWhenTheServiceCannotBeGivenItsParameters)
 {
     kestod.hide(path("home"));
