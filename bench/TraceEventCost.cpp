@@ -153,7 +153,7 @@ public:
         constexpr std::chrono::seconds patience(10);
         for (const auto start = Clock::now(); !kesto::Tracer(client_).isActive(); std::this_thread::yield())
             if (Clock::now() - start > patience)
-                throw std::runtime_error("the client is handed no marker");
+                throw std::runtime_error("the client got no marker");
         setTracing(false);
     }
 

@@ -46,7 +46,7 @@ void printHelp()
     fmt::print("Usage: kesto_bench [--filter TEXT] [--rounds N] [--json FILE] [--service PROGRAM]\n\n"
                "Measures Kesto reporting beside its peers and prints a table: the figure, the peer's figure from the\n"
                "same run, their ratio, the target. Every figure is the median of the rounds.\n\n"
-               "  --filter TEXT      only the groups whose name contains it\n"
+               "  --filter TEXT      only the groups with TEXT in their name\n"
                "  --rounds N         rounds of each measurement, {} at least; {} by default\n"
                "  --json FILE        write all figures, round by round, to the file, too\n"
                "  --service PROGRAM  the service to measure; {} by default\n"

@@ -189,7 +189,7 @@ void serve(int channel, const fs::path& directory)
     const auto journald = ChildProcess::execute({program}, {}, "/var/log/output");
     waitUntil([&] { return fs::exists("/run/systemd/journal/socket") || journald.hasEnded(); }, "socket");
     if (journald.hasEnded())
-        throw std::runtime_error("journald ended at once");
+        throw std::runtime_error("journald ended immediately");
     Journal journal;
     journal.open();
     std::uint32_t number = numberMark;

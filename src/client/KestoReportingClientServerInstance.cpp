@@ -39,9 +39,10 @@ KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
                   "client {} was refused {} sessions: it may have {}, and all clients {}", processIdentifier_,
                   sessionsRefused_, mostSessions, mostSessionsOfTheService);
     if (receiversRefused_ != 0)
-        KESTO_LOG(KestoReportingClientCategory(), Error,
-                  "messages of client {} were not delivered {} times: one may take {} bytes at all who receive it",
-                  processIdentifier_, receiversRefused_, mostBytesOfADelivery);
+        KESTO_LOG(
+            KestoReportingClientCategory(), Error,
+            "messages of client {} were not delivered {} times: a message may take {} bytes in all of its receivers",
+            processIdentifier_, receiversRefused_, mostBytesOfADelivery);
     KESTO_LOG(KestoReportingClientCategory(), Default, "dealloc {} from the server client list", processIdentifier_);
 }
 

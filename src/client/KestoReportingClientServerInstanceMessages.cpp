@@ -91,10 +91,11 @@ std::size_t KestoReportingClientServerInstance::mostReceivers(const Message& mes
 void KestoReportingClientServerInstance::countRefusedReceivers(std::size_t receivers)
 {
     if (receiversRefused_ == 0 && receivers != 0)
-        KESTO_LOG(KestoReportingClientCategory(), Error,
-                  "a message of client {} is not delivered to {} sessions: it may take {} bytes at all who receive it; "
-                  "further ones are counted until the client goes",
-                  processIdentifier_, receivers, mostBytesOfADelivery);
+        KESTO_LOG(
+            KestoReportingClientCategory(), Error,
+            "a message of client {} is not delivered to {} sessions: it may take {} bytes in all of its receivers; "
+            "further ones are counted until the client goes",
+            processIdentifier_, receivers, mostBytesOfADelivery);
     receiversRefused_ += receivers;
 }
 

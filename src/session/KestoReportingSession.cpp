@@ -154,7 +154,7 @@ void KestoReportingSession::stop(platform::Turn& turn)
     sendSummaryEvent();
     stopTracing();
     if (messagesLost_ != 0)
-        KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for want of memory", reporterID_,
+        KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for lack of memory", reporterID_,
                   messagesLost_);
     letGoOfMessages();
     started_ = false;

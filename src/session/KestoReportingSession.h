@@ -183,7 +183,7 @@ private:
     const std::shared_ptr<session::StorageBudget> budget_;
     session::StorageShare configurationShare_ KESTO_GUARDED_BY(configurationLock_);
     session::StorageShare driverSnapShotShare_;
-    mutable std::uint64_t messagesLost_ = 0; // in this run, for want of memory
+    mutable std::uint64_t messagesLost_ = 0; // in this run, for lack of memory
     mutable foundation::Mutex configurationLock_;
     mutable foundation::Mutex nestedAggregatedPayloadDataLock_;
 };

@@ -65,14 +65,14 @@ void KestoReportingSession::startTracing()
     if (!allowsKernelTrace(configuration) || file == nullptr || file->isNull())
         return;
     if (TraceRunner::numberOfRunners() >= TraceRunner::mostAtOnce) {
-        KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} is not traced: {} others are", reporterID_,
-                  TraceRunner::mostAtOnce);
+        KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} is not traced: {} other sessions are",
+                  reporterID_, TraceRunner::mostAtOnce);
         return;
     }
     const std::string path = file->text();
     if (path.size() > longestTracingFileName) {
         KESTO_LOG(KestoReportingSessionCategory(), Error,
-                  "session {} is not traced: the path of its parameters file has {} bytes; no more than {} are a path",
+                  "session {} is not traced: the path of its parameters file has {} bytes; a path has at most {}",
                   reporterID_, path.size(), longestTracingFileName);
         return;
     }

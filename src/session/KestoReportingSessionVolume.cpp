@@ -135,11 +135,11 @@ public:
         }
         if (eventsBeyondBound_ != 0)
             KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Error,
-                      "{} volume events are lost: with them there would be more than {} bytes", eventsBeyondBound_,
+                      "{} volume events are lost: with them all would take more than {} bytes", eventsBeyondBound_,
                       KestoReportingSession::mostVolumeEventBytes);
         if (eventsUnpaid_ != 0)
             KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Error,
-                      "{} volume events are lost for want of memory", eventsUnpaid_);
+                      "{} volume events are lost for lack of memory", eventsUnpaid_);
         return events;
     }
 

@@ -145,7 +145,7 @@ void TraceRunner::processEvents(Trace& trace)
         return;
     const TraceEvents& events = *traceEvents_.at(&trace);
     if (events.lost() != 0)
-        KESTO_LOG(KestoReportingTraceCategory(), Error, "trace {} lost {} events for want of memory", trace.name(),
+        KESTO_LOG(KestoReportingTraceCategory(), Error, "trace {} lost {} events for lack of memory", trace.name(),
                   events.lost());
     trace.processTracepoints(*session->second, events.all());
     lostEvents_ += session->second->lostEvents() + events.lost();

@@ -149,7 +149,7 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
         return IsLine(Error, "kerc",
                       "a message of client " + std::to_string(pid) + " is not delivered to "
                           + std::to_string(sessions - receivers)
-                          + " sessions: it may take 67108864 bytes at all who receive it; further ones are counted "
+                          + " sessions: it may take 67108864 bytes in all of its receivers; further ones are counted "
                             "until the client goes");
     };
     EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered)) << "the client is answered as always";
@@ -172,7 +172,7 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
     const auto refused = [&](int pid, std::int64_t times) {
         return IsLine(Error, "kerc",
                       "messages of client " + std::to_string(pid) + " were not delivered " + std::to_string(times)
-                          + " times: one may take 67108864 bytes at all who receive it");
+                          + " times: a message may take 67108864 bytes in all of its receivers");
     };
     EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1001, 2 * (sessions - receivers))).Times(1));
     EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused(1002, sessions - receivers)).Times(1));

@@ -329,7 +329,7 @@ TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
 
     platform.log.clear();
     session.stop(platform.turn);
-    EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerr", "session 42 lost 4 messages for want of memory")))
+    EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerr", "session 42 lost 4 messages for lack of memory")))
         << "its summary is the fourth";
     EXPECT_EQ(budget->taken(), 0U);
 

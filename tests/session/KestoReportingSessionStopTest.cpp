@@ -289,7 +289,7 @@ TEST_F(SessionStop, PaysForVolumeEventsFromItsBudgetUntilTheyAreRecorded)
     EXPECT_GT(events.size(), 900U);
     EXPECT_THAT(platform.log.lines("keri"),
                 Contains(IsLine(Error, "keri",
-                                std::to_string(2999 - events.size()) + " volume events are lost for want of memory")));
+                                std::to_string(2999 - events.size()) + " volume events are lost for lack of memory")));
     ASSERT_THAT(platform.fileSystem.files, SizeIs(1));
     EXPECT_THAT(platform.fileSystem.files.begin()->second,
                 HasSubstr("\"Volume_Summary_" + std::to_string(events.size() / 2) + '"'))

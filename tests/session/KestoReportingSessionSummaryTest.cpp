@@ -188,7 +188,7 @@ TEST(SummaryOfManyValues, IsLostWhenTheBudgetHasNoRoomForIt)
     EXPECT_THAT(platform.log.lines(),
                 testing::Contains(IsLine(Error, "kerr", "no memory left for the summary of session 42; it is lost")));
     EXPECT_THAT(platform.log.lines(),
-                testing::Contains(IsLine(Error, "kerr", "session 42 lost 2 messages for want of memory")));
+                testing::Contains(IsLine(Error, "kerr", "session 42 lost 2 messages for lack of memory")));
     EXPECT_EQ(budget->taken(), 0U);
 }
 

@@ -244,8 +244,8 @@ TEST_F(SessionTracing, DoesNotStartWithATextThatIsTooLongForAPathWhichIsSaid)
     EXPECT_THAT(lines(),
                 ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42"),
                             IsLine(Error, "kerr",
-                                   "session 42 is not traced: the path of its parameters file has 4096 bytes; no more "
-                                   "than 4095 are a path")));
+                                   "session 42 is not traced: the path of its parameters file has 4096 bytes; a path "
+                                   "has at most 4095")));
 }
 
 TEST_F(SessionTracing, IsNotStartedAnewByASecondStart)
@@ -270,7 +270,7 @@ TEST_F(SessionTracing, DoesNotStartWhenTooManyOthersRunWhichIsSaid)
     EXPECT_FALSE(session->startedTracing());
     EXPECT_THAT(lines(),
                 ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42"),
-                            IsLine(Error, "kerr", "session 42 is not traced: 64 others are")));
+                            IsLine(Error, "kerr", "session 42 is not traced: 64 other sessions are")));
     session->stop(platform.turn);
 
     others.pop_back();

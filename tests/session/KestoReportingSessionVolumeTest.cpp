@@ -540,7 +540,7 @@ TEST_F(SessionVolumeEvents, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
     EXPECT_THAT(platform.log.lines("keri"),
                 testing::Contains(IsLine(Error, "keri",
                                          std::to_string(changes + 1 - fit)
-                                             + " volume events are lost: with them there would be more than 67108864 "
+                                             + " volume events are lost: with them all would take more than 67108864 "
                                                "bytes"))
                     .Times(1));
 }
@@ -636,7 +636,7 @@ TEST_F(SessionVolumeEvents, AreLostWhenTheBudgetHasNoRoomForThem)
     EXPECT_THAT(
         platform.log.lines("keri"),
         testing::Contains(IsLine(Error, "keri",
-                                 std::to_string(10'000 - events.size()) + " volume events are lost for want of memory"))
+                                 std::to_string(10'000 - events.size()) + " volume events are lost for lack of memory"))
             .Times(1));
 }
 

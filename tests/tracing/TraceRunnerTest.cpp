@@ -280,7 +280,7 @@ TEST_F(Runner, SaysHowManyEventsThereWasNoMemoryFor)
     runner->stopTracingandProcessResults();
     EXPECT_THAT(file().measurements, SizeIs(TraceEvents::firstRoom / 2));
     EXPECT_THAT(platform.log.lines(),
-                testing::Contains(IsLine(Error, "kert", "trace one lost 6 events for want of memory")));
+                testing::Contains(IsLine(Error, "kert", "trace one lost 6 events for lack of memory")));
     EXPECT_EQ(file().remarks.at("lostEvents"), foundation::Value(6));
 }
 

@@ -76,7 +76,8 @@ void Observer::stop()
     connection_.reset();
     graph_.endStreams(currentMoment());
     if (const auto ignored = graph_.ignoredObjects())
-        diagnostics_.say("{} of PipeWire's objects were ignored, because there were too many at once", ignored);
+        diagnostics_.say("{} of PipeWire's objects were ignored, because there were too many at the same time",
+                         ignored);
 }
 
 void Observer::connect()

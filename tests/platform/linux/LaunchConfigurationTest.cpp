@@ -273,7 +273,7 @@ TEST_F(LaunchConfigurationTest, AnythingElseThatIsPassedIsRefused)
             if (passSocket(type, listens, root / "run" / name) != 0)
                 return 10;
             return problem()
-                    == "LISTEN_FDS: socket activation passed something else than one listening Unix stream socket: "
+                    == "LISTEN_FDS: socket activation passed something other than one listening Unix stream socket: "
                        "correct the socket unit"
                 ? 0
                 : 11;

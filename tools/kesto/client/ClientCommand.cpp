@@ -213,7 +213,7 @@ private:
 void addClientCommand(CLI::App& application, int& exitStatus)
 {
     const auto options = std::make_shared<ClientOptions>();
-    CLI::App* command = application.add_subcommand("client", "Calls the operations of the service, one a line");
+    CLI::App* command = application.add_subcommand("client", "Calls the operations of the service, one in each line");
     command->add_option("--socket", options->socket, "The service's socket, if it is not at its usual place");
     command->add_option("--wait", options->wait, "How many seconds to wait for the last answers")
         ->check(CLI::NonNegativeNumber)
@@ -223,7 +223,7 @@ void addClientCommand(CLI::App& application, int& exitStatus)
   ["setServiceType", "longformaudio", 42]
   ["setConfiguration", {"HostApplicationDisplayID": "org.example.player"}, 42]
   ["start", 42]                    answered when the session is stopped; where kernel traces are on,
-                                   that of a session of the type "test" is answered at once, too
+                                   that of a "test" session is answered immediately, too
   ["send", {"volume": 0.5}, "Playback", "Start", [42]]     null in place of the list: all started sessions
   ["getServiceName", 42]  ["validate", 42]  ["getAllReporters"]
   ["stop", 42]  ["destroy", 42]  ["kill"]

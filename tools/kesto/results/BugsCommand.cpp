@@ -161,7 +161,7 @@ void addBugsCommand(CLI::App& application, int& exitStatus)
     CLI::App* command = application.add_subcommand("bugs", "Lists the captured bugs, or shows one");
     command->add_option("NUMBER", options->number, "The bug to show with all its details");
     command->add_option("--directory", options->directory, "The captures, if they are not at their usual place");
-    command->add_flag("--json", options->isJson, "One JSON object a line, for programs");
+    command->add_flag("--json", options->isJson, "One JSON object in each line, for programs");
     command->callback([options, &exitStatus] {
         if (options->directory.empty())
             options->directory = usualDatabase().parent_path() / "bug-captures";

@@ -295,7 +295,7 @@ void addChannelsCommand(CLI::App& application, int& exitStatus)
     command->add_option("--count", options->count, "End after this many intervals")
         ->check(CLI::NonNegativeNumber)
         ->needs(watch);
-    command->add_flag("--json", options->isJson, "One JSON object a line, for programs");
+    command->add_flag("--json", options->isJson, "One JSON object in each line, for programs");
     command->callback([options, &exitStatus] {
         if (options->root.empty())
             options->root = usualRoot();

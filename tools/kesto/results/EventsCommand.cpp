@@ -179,7 +179,7 @@ void addEventsCommand(CLI::App& application, int& exitStatus)
     command->add_option("--count", options->filter.mostRecent, "At most this many, the most recent ones")
         ->check(CLI::NonNegativeNumber);
     command->add_flag("--follow", options->isFollowing, "Print further events as they come");
-    command->add_flag("--json", options->isJson, "One JSON object a line, for programs");
+    command->add_flag("--json", options->isJson, "One JSON object in each line, for programs");
     command->callback([options, &exitStatus] {
         if (options->database.empty())
             options->database = usualDatabase();

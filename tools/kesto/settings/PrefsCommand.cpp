@@ -172,7 +172,7 @@ void addPrefsCommand(CLI::App& application, int& exitStatus)
     CLI::App* listing = verbs.add("list", "Lists the keys of a domain, or the domains", list);
     listing->get_option("DOMAIN")->required(false);
     verbs.addJson(listing);
-    command->footer(R"(A running service notices a change by itself:
+    command->footer(R"(A running service notices each change:
   kesto prefs set com.quarn.kesto device_name "Kitchen radio"
   kesto prefs set com.quarn.halden spatial-audio-accessory-feature true
 A VALUE that begins with "-" and is not a number must follow "--": kesto prefs set DOMAIN KEY -- -text)");

@@ -55,7 +55,7 @@ void addTraceCommand(CLI::App& application, int& exitStatus)
     CLI::Option* file =
         command->add_option("FILE", options->file,
                             "A results file, such as Audio/Traces/tracing_results.qdj of the service's log directory");
-    CLI::Option* json = command->add_flag("--json", options->isJson, "One JSON object a name, for programs");
+    CLI::Option* json = command->add_flag("--json", options->isJson, "One JSON object for each name, for programs");
     command->require_subcommand(0, 1);
     const CLI::App* record = addRecordCommand(*command, *options);
     command->callback([record, options, file, json, &exitStatus] {

@@ -59,7 +59,7 @@ std::string description(const ListeningSocketFailure& failure)
 {
     switch (failure.error) {
     case ListeningSocketError::NotOneUnixListener:
-        return "socket activation passed something else than one listening Unix stream socket";
+        return "socket activation passed something other than one listening Unix stream socket";
     case ListeningSocketError::PathTooLong: return "the path is too long for a socket";
     case ListeningSocketError::NotASocket: return "something that is not a socket is in the way";
     case ListeningSocketError::AlreadyInUse: return "another process listens there";

@@ -12,7 +12,7 @@
 namespace platform {
 
 enum class ListeningSocketError : std::uint8_t {
-    NotOneUnixListener, // socket activation passed something else than one listening Unix stream socket
+    NotOneUnixListener, // socket activation passed something other than one listening Unix stream socket
     PathTooLong, // longer than the address of a Unix socket
     NotASocket, // something that is not a socket stands at the path
     AlreadyInUse, // another process listens at the path

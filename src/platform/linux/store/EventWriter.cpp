@@ -68,7 +68,8 @@ EventWriter::Expected<> EventWriter::ensureOpen()
     if (database_ && !database_->wasReplaced())
         return {};
     if (database_) {
-        log_.error("{} was taken away; events are kept in the one that is there now, or in a new one", path_.native());
+        log_.error("{} was removed or replaced; events are now kept in the file that is there, or in a new one",
+                   path_.native());
         database_.reset();
     } else if (clock_.systemUptime() < openAgainAt_) {
         return std::unexpected(openError_);
@@ -116,7 +117,7 @@ bool EventWriter::setAside(StoreError reason)
         fs::rename(withSuffix(path_, suffix), withSuffix(target, suffix), isNotThere);
     }
     log_.error("{} {}; it is now {}, and a new one is begun", path_.native(),
-               isNewer ? "was made by a later version of the service" : "is damaged or no database of events",
+               isNewer ? "was made by a later version of the service" : "is damaged or not a database of events",
                target.native());
     return true;
 }

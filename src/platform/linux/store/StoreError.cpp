@@ -22,7 +22,8 @@ StoreErrorWords words(StoreError error) noexcept
     case StoreError::LogHeld:
         return {"a program has been reading the database for too long", "end it, or let it read in short transactions"};
     case StoreError::NotJson:
-        return {"their payloads hold NaN or infinity, which JSON cannot say", "correct the programs that send them"};
+        return {"their payloads hold NaN or infinity, which JSON cannot express",
+                "correct the programs that send them"};
     case StoreError::Other: return {"SQLite refused", "restart the service and report this"};
     }
     return {"unknown", "report this"};

@@ -95,7 +95,7 @@ KernelTraceWallTime TraceFanOut::wallTime(std::uint64_t timestamp) const
 void TraceFanOut::complete(const Subscription& subscription) const
 {
     if (subscription->lost != 0)
-        log_.error("a trace session of {:.3f} s lost up to {} events: they came faster than they were taken",
+        log_.error("a trace session of {:.3f} s lost up to {} events: they came faster than the service read them",
                    static_cast<double>(subscription->endTime - subscription->startTime) / 1e9, subscription->lost);
     if (subscription->completion)
         subscription->queue->submit([subscription] {

@@ -70,7 +70,7 @@ INSTANTIATE_TEST_SUITE_P(
         std::pair(StoreError::LogHeld,
                   "a program has been reading the database for too long; end it, or let it read in short transactions"),
         std::pair(StoreError::NotJson,
-                  "their payloads hold NaN or infinity, which JSON cannot say; correct the "
+                  "their payloads hold NaN or infinity, which JSON cannot express; correct the "
                   "programs that send them"),
         std::pair(StoreError::Other, "SQLite refused; restart the service and report this")));
 

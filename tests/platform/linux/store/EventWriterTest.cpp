@@ -210,7 +210,7 @@ TEST_F(EventWriterTest, WhatJsonCannotSayIsLostAndNothingElse)
     EXPECT_THAT(log.take(),
                 ElementsAre(support::IsLine(LogLevel::Error, "kerl",
                                             "3 analytics events were lost (3 since the start): " + file().string()
-                                                + ": their payloads hold NaN or infinity, which JSON cannot say; "
+                                                + ": their payloads hold NaN or infinity, which JSON cannot express; "
                                                   "correct the programs that send them")));
 }
 
@@ -260,7 +260,7 @@ TEST_F(EventWriterTest, AFileThatIsNoDatabaseIsSetAside)
     EXPECT_EQ(support::readFile(aside), std::string(5000, 'x'));
     EXPECT_THAT(log.take(),
                 ElementsAre(support::IsLine(LogLevel::Error, "kerl",
-                                            file().string() + " is damaged or no database of events; it is now "
+                                            file().string() + " is damaged or not a database of events; it is now "
                                                 + aside.string() + ", and a new one is begun")));
 }
 
@@ -278,7 +278,7 @@ TEST_F(EventWriterTest, ADatabaseOfSomethingElseIsSetAside)
         clock.advance(1);
         keep({event(1)});
         EXPECT_EQ(StoreReader(file()).eventCount(), 1) << sql;
-        EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("no database of events")))) << sql;
+        EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("not a database of events")))) << sql;
     }
 }
 
@@ -298,7 +298,7 @@ TEST_F(EventWriterTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events"), ElementsAre("after"));
     EXPECT_EQ(writer().keptEvents(), 1U);
     EXPECT_THAT(filesNamed(".corrupt-"), SizeIs(3)); // with the log and its index
-    EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("is damaged or no database of events"))));
+    EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("is damaged or not a database of events"))));
 }
 
 TEST_F(EventWriterTest, OnlySoManyDamagedDatabasesAreKept)
@@ -359,7 +359,7 @@ TEST_F(EventWriterTest, ADatabaseThatIsTakenAwayIsBegunAnew)
     fs::remove(file());
     keep({event(2, "b")});
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events"), ElementsAre("b"));
-    EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("was taken away"))));
+    EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("was removed or replaced"))));
 }
 
 TEST_F(EventWriterTest, ADatabaseThatIsPutInItsPlaceIsGoneOnWith)

@@ -233,8 +233,8 @@ TEST_F(TraceFanOutTest, SaysHowManyEventsASessionMayHaveLost)
     fanOut.deliver({}, 2'600'000'000, 5);
     EXPECT_THAT(log.lines(),
                 ElementsAre(IsLine(LogLevel::Error, "kerl",
-                                   "a trace session of 1.500 s lost up to 12 events: they came faster than they were "
-                                   "taken")));
+                                   "a trace session of 1.500 s lost up to 12 events: they came faster than the service "
+                                   "read them")));
 }
 
 TEST_F(TraceFanOutTest, LosesWhatAQueueIsTooFarBehindWith)
