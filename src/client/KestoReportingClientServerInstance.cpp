@@ -120,7 +120,8 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
     });
 }
 
-// The log has a line for the first, in time for the administrator to act; a client may cause any number of them.
+// The first refusal has a log line, in time for the administrator to act. The others are counted, because a client can
+// cause any number of them.
 void KestoReportingClientServerInstance::countRefusedSession()
 {
     if (sessionsRefused_++ == 0)
@@ -260,7 +261,7 @@ void KestoReportingClientServerInstance::reporterID(std::int64_t reporterID, Dic
 void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
 {
     submit([reply = std::move(reply)](auto& self, platform::Turn& turn) {
-        if (self.isConnectionLost_) // who asked very often and did not listen keeps nobody waiting
+        if (self.isConnectionLost_) // the calls that it left waiting must not delay others
             return;
         std::vector<foundation::Value> reporterIDs;
         if (const auto delegate = self.delegate_.lock())
@@ -275,7 +276,7 @@ void KestoReportingClientServerInstance::killService(SuccessReply)
 {
     KESTO_LOG(KestoReportingClientCategory(), Default, "DESTROYING SERVICE");
     constexpr int exitStatus = 2;
-    std::_Exit(exitStatus); // at once: other threads are at work, and what was acknowledged is kept already
+    std::_Exit(exitStatus); // immediately, because other threads are running; acknowledged events are kept already
 }
 
 void KestoReportingClientServerInstance::handleConnectionError()
@@ -307,7 +308,7 @@ void KestoReportingClientServerInstance::logActiveSessions(KestoReportingService
 
 std::string client::descriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions)
 {
-    constexpr std::size_t longest = std::size_t{24} << 10; // about what a line of the log shows
+    constexpr std::size_t longest = std::size_t{24} << 10; // roughly what one log line shows
     std::vector<foundation::Value> descriptions;
     std::size_t length = 0;
     for (const auto& session : sessions) {

@@ -17,19 +17,19 @@
 #include <optional>
 #include <string>
 
-// Always owned by a shared pointer. Operations of the protocol on a connection thread, the rest on the server
-// queue but for what says otherwise.
+// Always owned by a shared pointer. The operations of the protocol run on a connection thread, and everything else on
+// the server queue, unless a comment says otherwise.
 class KestoReportingClientServerInstance final
     : public KestoReportingServiceProtocol,
       public std::enable_shared_from_this<KestoReportingClientServerInstance> {
 public:
-    // More sessions than that are not created, of a client or of all of them; the client is answered as always, and
-    // the log tells of the first and, when the client goes, how many they were. The IDs of all must fit into one
-    // frame, which `getAllReporters` answers.
+    // The most sessions of one client, and of all clients. The service creates no more; it answers the client as
+    // always, logs the first refusal, and logs their number when the client goes. The IDs of all sessions must fit into
+    // one frame, because `getAllReporters` answers them.
     static constexpr std::size_t mostSessions = 10'000;
     static constexpr std::size_t mostSessionsOfTheService = 110'000;
-    // What a message takes, times its receivers; it is not delivered to those beyond, but to one at least. The client
-    // is answered as always, and the log tells in the same way.
+    // The limit of a message's size times the number of its receivers. Receivers beyond it do not get the message, but
+    // one always does. The client is answered as always, and the log reports this like refused sessions.
     static constexpr std::size_t mostBytesOfADelivery = std::size_t{64} << 20;
 
     KestoReportingClientServerInstance(std::int32_t processIdentifier,
@@ -40,14 +40,14 @@ public:
 
     // Any thread.
     [[nodiscard]] std::int32_t processIdentifier() const { return processIdentifier_; }
-    // When the client was registered (seconds since 1970), and its name then. Any thread.
+    // When the client was registered (seconds since 1970), and the name that it had then. Any thread.
     [[nodiscard]] std::optional<double> clientStartDate() const;
     void setClientStartDate(std::optional<double> date);
     [[nodiscard]] std::optional<std::string> clientProcessName() const;
     void setClientProcessName(std::optional<std::string> name);
 
     [[nodiscard]] const client::SessionMap& clientReportingSessionMap() const { return clientReportingSessionMap_; }
-    // This client's session of that ID or, when asked to look further, that of any client.
+    // This client's session of that ID, or, if the caller allows it, that of any client.
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID,
                                                                                    bool acrossAllClients) const;
 
@@ -64,8 +64,8 @@ public:
     void getAllReporters(ArrayReply reply) override;
     [[noreturn]] void killService(SuccessReply reply) override;
 
-    // The connection broke or is over: stops and drops all sessions and leaves the registry. A second call finds
-    // nothing left to do. Any thread.
+    // Call this when the connection breaks or ends: it stops and drops all sessions and leaves the registry. A second
+    // call has no effect. Any thread.
     void handleConnectionError();
 
 private:
@@ -119,7 +119,7 @@ private:
 
 namespace client {
 
-// The sessions' descriptions as one text for the log, as many as a line of it shows.
+// The sessions' descriptions as one text for the log; further ones are left out when a log line is full.
 [[nodiscard]] std::string descriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions);
 
 } // namespace client

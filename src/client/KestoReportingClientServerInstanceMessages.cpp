@@ -1,4 +1,4 @@
-// Delivering a message: to each session that it is for, and beside the session to every sink.
+// Delivering a message to each of its sessions, and beside each session to every sink.
 //
 // With a list of reporters the sinks come first and the session last; without one, the session comes first.
 // Both orders are part of the contract.
@@ -20,7 +20,7 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
                                                      std::uint16_t type, std::optional<ReporterIDs> reporterIDs,
                                                      utility::Reply reply)
 {
-    // The sender is whoever makes this call, which need not be the process that this client was made for.
+    // The sender is the process that makes this call, which need not be the process that this client was made for.
     const platform::Connection* caller = platform::Connection::current();
     const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
     auto processName = KestoReportingUtilityProcessNameForPID(sender);
@@ -80,7 +80,7 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn&
         deliverStandalone(turn, delegate, message);
 }
 
-// A message of a million bytes to ten thousand sessions would hold up all clients for a minute.
+// Without this limit, a message of a million bytes to ten thousand sessions would delay all clients for a minute.
 std::size_t KestoReportingClientServerInstance::mostReceivers(const Message& message, std::size_t wanted)
 {
     if (wanted <= 1)

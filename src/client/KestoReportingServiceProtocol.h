@@ -1,7 +1,7 @@
 // The interface that the service exports on every client connection.
 //
-// Every operation is one-way and answers through its reply, perhaps later than operations called after it, and
-// in one case twice. Reporter IDs are chosen by the client; 0 stands for no session.
+// Every operation is one-way. It answers through its reply, perhaps later than operations that were called after it,
+// and one operation answers twice. Clients choose reporter IDs; 0 means no session.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -27,7 +27,7 @@ public:
     // In the order of `client::serviceOperations`.
     virtual void createReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
     virtual void setServiceType(AudioServiceType serviceType, std::int64_t reporterID, SuccessReply reply) = 0;
-    // Answers ID 0 twice: at once with 65535, and with what the look-up finds.
+    // Answers ID 0 twice: first 65535, without a wait, and then what the look-up finds.
     virtual void getServiceNameForReporterID(std::int64_t reporterID, ServiceTypeReply reply) = 0;
     virtual void setConfiguration(foundation::Dictionary configuration, std::int64_t reporterID,
                                   SuccessReply reply) = 0;
@@ -38,7 +38,7 @@ public:
                              std::optional<ReporterIDs> reporterIDs, utility::Reply reply) = 0;
     virtual void stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply) = 0;
     virtual void destroyReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
-    // Answers {"reporterID", "serviceType"}: 0 and 65535 when there is no such session.
+    // Answers {"reporterID", "serviceType"}; they are 0 and 65535 without such a session.
     virtual void reporterID(std::int64_t reporterID, DictionaryReply valid) = 0;
     virtual void getAllReporters(ArrayReply reply) = 0;
     // Ends the process with exit status 2; the reply is never called.

@@ -1,8 +1,7 @@
-// The operations that the service offers to clients: one table, which the service, the client library and the tool
-// read.
+// The table of the operations that the service offers to clients. The service, the client library and the tool read it.
 //
-// A row tells all that a frame needs: the operation's number on the wire, what it takes and what it answers. Both
-// ends of a connection go by it, so they cannot disagree.
+// A row holds all that a frame needs: the operation's number on the wire, its arguments and its result. Both ends of a
+// connection use the table, so they cannot disagree.
 #pragma once
 
 #include <algorithm>
@@ -81,7 +80,7 @@ inline constexpr auto serviceOperations = [] {
     });
 }();
 
-// The operation of that number; null pointer when there is none.
+// The operation of that number, or null.
 [[nodiscard]] constexpr const ServiceOperation* serviceOperationNumbered(std::int64_t number)
 {
     if (number < 1 || std::cmp_greater(number, serviceOperations.size()))
@@ -89,7 +88,7 @@ inline constexpr auto serviceOperations = [] {
     return &serviceOperations[static_cast<std::size_t>(number) - 1];
 }
 
-// A message to more is refused: each of them is worth as much work as the message, and takes a byte of the frame.
+// A message to more reporters is refused: each of them costs as much work as the message, but only a byte of the frame.
 inline constexpr std::size_t mostReportersOfAMessage = 10'000;
 
 } // namespace client

@@ -1,5 +1,5 @@
-// The table of the operations says what a call is made of, and the operation's parameters say what its arguments
-// become. The arguments are taken one by one, and the first that does not fit decides what is said about the call.
+// The table of the operations says which arguments a call has; the parameters of the operation's function say which
+// types they become. The arguments are taken one by one; the first wrong one decides what the log says about the call.
 #include "client/ServiceProtocolAdapter.h"
 
 #include "client/ServiceOperations.h"
@@ -21,8 +21,8 @@ using foundation::Dictionary;
 using foundation::Value;
 using platform::Connection;
 
-// Where the replies of one call go. Copies are held by whoever may answer; the last one lets the connection know
-// that the call is done with.
+// Where the replies of one call go. Everything that may reply holds a copy; when the last copy goes, the connection
+// knows that the call is finished.
 class ReplyAddress {
 public:
     ReplyAddress(std::shared_ptr<Connection> caller, std::uint64_t call) : caller_(std::move(caller)), call_(call) { }
@@ -62,8 +62,8 @@ std::string_view nameOf(OperationArgument argument)
     return {};
 }
 
-// Gives the parameters of an operation, in order, what a call has for them: its arguments, and at the end the reply.
-// What does not fit is remembered, and what was taken then is not used.
+// Gives each parameter of an operation its argument of the call, in order, and the last one the reply. It remembers the
+// first wrong argument; the caller then does not use what was taken.
 class Arguments {
 public:
     using ReporterIDs = KestoReportingServiceProtocol::ReporterIDs;
@@ -148,7 +148,7 @@ private:
 };
 
 using Protocol = KestoReportingServiceProtocol;
-// Takes the parameters, and calls the operation unless one was refused.
+// Takes the parameters, and calls the operation unless an argument was wrong.
 template <typename... Parameters>
 void callWith(Arguments& arguments, Protocol& protocol, void (Protocol::*operation)(Parameters...))
 {
@@ -171,7 +171,7 @@ constexpr auto calls = []<std::size_t... places>(std::index_sequence<places...>)
     }...};
 }(std::make_index_sequence<serviceOperations.size()>());
 
-// Whether a parameter can hold every value of the argument.
+// Whether the parameter can hold every value of the argument.
 template <typename Parameter> constexpr bool holds(OperationArgument argument)
 {
     switch (argument) {
@@ -187,7 +187,7 @@ template <typename Parameter> constexpr bool holds(OperationArgument argument)
     return false;
 }
 
-// Whether a reply brings the result.
+// Whether the reply carries the result.
 template <typename Reply> constexpr bool brings(OperationResult result)
 {
     switch (result) {
@@ -234,7 +234,7 @@ std::expected<void, Connection::Violation> ServiceProtocolAdapter::handleCall(Co
         return violation("a call's number is an unsigned 64-bit integer");
     const auto methodNumber = values[1].exactly<std::int64_t>();
     constexpr std::size_t methodCount = serviceOperations.size();
-    if (!methodNumber) // not repeated to the log, where it could fill a disk or forge lines
+    if (!methodNumber) // not repeated in the log, where it could fill the disk or forge lines
         return violation(foundation::format("a call's method is an integer from 1 to {}", methodCount));
     const ServiceOperation* operation = serviceOperationNumbered(*methodNumber);
     if (operation == nullptr)

@@ -1,5 +1,5 @@
-// Between the wire and the protocol: checks the array of values that a client sent, calls the operation it names,
-// and turns each reply into a frame.
+// The adapter between the wire and the protocol: checks the array of values that a client sent, calls the operation
+// that it names, and turns each reply into a frame.
 //
 // A call is [call, method, arguments...]; a reply is [call, error, values...], error being null or
 // [domain, code]. Methods are numbered from 1 in the order of the protocol.
@@ -13,7 +13,7 @@
 
 namespace client {
 
-// One a connection, which owns it; used on the connection's thread.
+// Each connection owns one and uses it on its thread.
 class ServiceProtocolAdapter {
 public:
     // Calls go to the exported object.
@@ -22,7 +22,7 @@ public:
     {
     }
 
-    // Carries out one call, or says what is wrong with it.
+    // Carries out one call, or returns what is wrong with it.
     std::expected<void, platform::Connection::Violation> handleCall(platform::Connection::Call call);
 
 private:

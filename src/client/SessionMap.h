@@ -1,7 +1,7 @@
-// A client's sessions by reporter ID, in the order in which their IDs first came.
+// A client's sessions by reporter ID, in the order in which the client first used the IDs.
 //
-// A replaced session leaves its place to the new one. Looking up, adding and removing cost the same whatever
-// the number of sessions and the IDs that clients choose.
+// A session that replaces another takes its place in the order. Looking up, adding and removing cost the same for any
+// number of sessions and for any IDs that clients choose.
 #pragma once
 
 #include "foundation/values/IntegerHash.h"
@@ -14,7 +14,7 @@
 
 namespace client {
 
-// The owner keeps calls apart: one thread at a time.
+// One thread at a time, which the owner ensures.
 class SessionMap {
 public:
     struct Entry {
