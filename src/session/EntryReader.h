@@ -1,10 +1,10 @@
-// Reading payload after payload, entry by entry, where each says mostly what the one before it said.
+// Reads payloads one after the other, entry by entry, where most entries repeat those of the payload before.
 //
-// A player sends the same keys in the same order, and most of its values are what they were. So what stands at a place
-// is compared, still encoded, with what stood there in the payload of its kind before: equal bytes are an equal entry.
-// One comparison then saves taking the entry apart.
+// A player sends the same keys in the same order, and most values do not change. So the reader compares each entry,
+// still encoded, with the entry at the same place in the previous payload of its kind: equal bytes are an equal entry.
+// One comparison then saves decoding the entry.
 //
-// An entry that is as before is given as the item that it was before. So a reader of a million messages keeps the item
+// An entry that did not change is returned as the same item as before. So a reader of a million messages keeps the item
 // from which it derived something, and asks `isSameAs` whether it has to derive it again.
 #pragma once
 
@@ -22,11 +22,11 @@
 
 namespace session {
 
-// `Note` is what the reader wants to know of a key; it is kept with the place. One thread at a time.
+// `Note` is what the caller wants to know about a key; it is kept with the place. One thread at a time.
 template <typename Note> class EntryReader {
 public:
-    // Calls `visit(note, item)` for each entry, in order. `learn(key)` is asked for the note, unless it is known from
-    // the payload before. The items are valid as long as the entry reader, and the store records nothing.
+    // Calls `visit(note, item)` for each entry, in order. Calls `learn(key)` for the note unless the previous payload
+    // gave it. The items are valid as long as the entry reader exists and the store records nothing.
     template <typename Learn, typename Visit>
     void read(std::uint32_t kind, const MessageStore::Payload& payload, Learn learn, Visit visit)
     {
@@ -46,7 +46,7 @@ public:
 private:
     struct Place {
         std::string_view entry; // encoded, the key and the value
-        std::string_view key; // the same of the key alone
+        std::string_view key; // of the key alone, encoded
         foundation::CborItem item; // the value
         Note note{};
 
@@ -61,7 +61,7 @@ private:
             entry = from.substr(0, key.size() + item.bytes().size());
         }
     };
-    // More of both share what there is: they are read as well, only not remembered for long.
+    // Further kinds share these places: they are read as well, but not remembered for long.
     static constexpr std::size_t mostKinds = 8;
     static constexpr std::size_t mostPlaces = 64;
 
@@ -73,7 +73,7 @@ private:
         return encodedHere_.back();
     }
 
-    std::deque<std::string> encodedHere_; // which the store keeps unencoded
+    std::deque<std::string> encodedHere_; // payloads that the store keeps unencoded
     std::array<std::vector<Place>, mostKinds> places_;
 };
 

@@ -15,7 +15,8 @@
 
 namespace {
 
-// As much of the application's name as a log line needs: the client chooses it, and all sessions stand in one line.
+// The part of the application's name that a log line shows: the client chooses the name, and one line lists all
+// sessions.
 std::string applicationText(const foundation::Dictionary& configuration)
 {
     constexpr std::size_t longest = 256;
@@ -170,8 +171,8 @@ void KestoReportingSession::letGoOfMessages()
     platform::current().memory.letGo(bytes);
 }
 
-// To be read without its lock, which would keep recorders waiting for a disk: whoever stops the session is the one who
-// records, so nothing is recorded meanwhile.
+// The caller reads the store without the lock, under which recorders would wait for a disk. This is safe: the thread
+// that stops the session is the one that records.
 std::shared_ptr<const session::MessageStore> KestoReportingSession::store() const
 {
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
@@ -190,7 +191,7 @@ void KestoReportingSession::sendVolumeEvents(platform::Turn& turn)
     KESTO_LOG(KestoReportingSessionCategory(), Default, "sending volume event for reporter {}", reporterID_);
     const std::size_t paidForEach = share.bytes() / volumeEvents.size();
     for (auto& next : volumeEvents) {
-        const auto volumeEvent = std::exchange(next, {}); // it goes once the store has it
+        const auto volumeEvent = std::exchange(next, {}); // freed as soon as the store has it
         share.shrink(paidForEach);
         sendMessage(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
         KestoReportingFennicBridge::handleEvent(turn, volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,

@@ -1,8 +1,8 @@
-// One reporting session of one client process: identity, service type, configuration, and, between start and
-// stop, the messages that were sent to it.
+// One reporting session of one client process: its identity, service type and configuration, and, between start and
+// stop, the messages that it got.
 //
-// A session records what it is sent; handing that to the sinks is its client instance's work, which calls the session
-// and the sinks side by side. Only the volume events, which it derives itself, it hands to the analytics bridge.
+// A session records what it gets. Its client instance hands the same messages to the sinks. Only the volume events,
+// which the session derives itself, go from it to the analytics bridge.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -25,17 +25,17 @@
 struct TraceParams;
 class TraceRunner;
 
-// The one value of "KestoReportingTraceType" that lets a trace start. Told by its identity: text that a client
-// sends never is this object.
+// The one value of "KestoReportingTraceType" that lets a trace start. It is recognised by its identity, so text that a
+// client sends never counts as this value.
 extern const foundation::String KestoReportingTraceTypeKtrace;
 
-// Owned by a shared pointer. Driven from the server queue, on which all that its client instance keeps in it is read
-// and written. What sinks read (service type, configuration) may be read from any thread, and so may what it recorded.
+// Owned by a shared pointer. It runs on the server queue, where its client instance also reads and writes what it keeps
+// in it. Any thread may read what sinks read (service type, configuration) and what the session recorded.
 class KestoReportingSession final : public sinks::SinkSession,
                                     public std::enable_shared_from_this<KestoReportingSession> {
 public:
-    // The identity never changes. The first process is the session's owner. What the session keeps for its client is
-    // paid from the budget.
+    // The identity never changes. The first process is the session's owner. The budget pays for what the session keeps
+    // for its client.
     KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
                           std::shared_ptr<session::StorageBudget> budget = session::StorageBudget::service());
     ~KestoReportingSession() override;
@@ -49,104 +49,107 @@ public:
 
     void setServiceType(AudioServiceType type);
     [[nodiscard]] AudioServiceType serviceType() const override { return serviceType_; }
-    // The service type's name; empty until one was set.
+    // The service type's name; empty until a service type is set.
     [[nodiscard]] std::string_view serviceName() const { return serviceName_; }
 
     [[nodiscard]] foundation::Dictionary configuration() const override;
-    // Adds all entries, replacing those of the same key; no dictionary changes nothing. A configuration that would
-    // outgrow `largestConfiguration` bytes, or the budget, stays as it was, with a log line.
+    // Adds all entries, and replaces those of the same key. Without a dictionary it changes nothing. If the
+    // configuration would exceed `largestConfiguration` bytes or the budget, it stays as it was, and a log line says
+    // so.
     void setConfiguration(const std::optional<foundation::Dictionary>& configuration);
     void updateConfigurationWithContentsOfConfiguration(const std::optional<foundation::Dictionary>& configuration);
     static constexpr std::size_t largestConfiguration = std::size_t{1} << 20;
 
     [[nodiscard]] bool started() const { return started_; }
-    // Begins a run with an empty store; a session that is started already goes on as it is.
+    // Begins a run with an empty store. A session that has started already is not changed.
     void start();
-    // Ends the run and drops what it recorded; the events that it makes of that go with the turn. Nothing happens to a
+    // Ends the run and drops the recorded messages; the events made of them go with the turn. Has no effect on a
     // session that is not started.
     void stop(platform::Turn& turn);
 
     // Whether sessions of this service type may run kernel traces: those for tests, where the feature is enabled and
     // the system can trace.
     [[nodiscard]] bool mayBeTraced() const;
-    // Prepares a trace from a trace-parameters file, in the place of one that was prepared or is running. Without a
-    // file nothing changes.
+    // Prepares a trace from a trace-parameters file. It replaces a trace that is prepared or running. Without a file it
+    // changes nothing.
     void setupTracing(const std::optional<std::string>& fileName);
-    // Whether a trace of this session is running. One that is running when the session goes, goes with it.
+    // Whether a trace of this session is running. If the session is destroyed, so is its running trace.
     [[nodiscard]] bool startedTracing() const { return startedTracing_; }
-    // In bytes, as of any path. A start with a longer one begins no trace, with a log line.
+    // In bytes; no path is longer. A start with a longer name logs this and begins no trace.
     static constexpr std::size_t longestTracingFileName = 4095;
-    // Of the trace that is running or prepared.
+    // The file of the running or prepared trace.
     [[nodiscard]] const std::optional<std::string>& tracingFileName() const { return tracingFileName_; }
-    // Of the trace that is running or prepared; null without one.
+    // The runner of the running or prepared trace, or null.
     [[nodiscard]] const TraceRunner* traceRunner() const { return traceRunner_.get(); }
     [[nodiscard]] const TraceParams* traceParams() const { return traceParams_.get(); }
 
     // Called before the message's function returns, if at all.
     using MessageReply = std::function<void(const std::optional<utility::ReplyError>& error)>;
-    // Normalises and records the message, then calls the reply, if there is one, with no error. `sync` makes no
-    // difference: the message is always handled at once on the caller's thread. No message is an empty one.
+    // Normalises and records the message, then calls the reply, if there is one, without an error. `sync` has no
+    // effect: the message is always handled before this returns, on the caller's thread. An absent message counts as an
+    // empty one.
     void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
                      AudioEventType type, bool sync, const MessageReply& reply);
     void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
                      AudioEventType type, const MessageReply& reply);
-    // Records the normalised message, unless it repeats the one before of its kind: true when it was dropped
-    // for that.
+    // Records the normalised message unless it repeats the previous one of its kind. True if it was dropped as a
+    // repetition.
     bool createMessageIdentifier(AudioEventCategory category, AudioEventType type,
                                  const foundation::Dictionary& message);
-    // Accepts a message outside of any session and does nothing with it, a second later; the reply is not called.
+    // Accepts a message outside any session and, a second later, does nothing with it. The reply is not called.
     static void sendSingleMessage(const foundation::Dictionary& message, AudioEventCategory category,
                                   AudioEventType type, AudioServiceType serviceType,
                                   const foundation::Dictionary& userInfo, const MessageReply& reply);
 
-    // The payloads of the messages in order, those that carry any of the keys folded together: one that comes no more
-    // than the pause (seconds) after the one before joins it, at the place of the first of them. This is the
-    // definition; the volume analysis folds only the entries that it reads. The properties `RapidMessages` and
-    // `VolumeMessagesOfAnyStore` bind both to one description of it.
+    // The payloads of the messages in order. Those with any of the keys are folded: one that comes within the pause
+    // (seconds) after the previous one is merged into it, at the place of the first. This is the definition; the volume
+    // analysis folds only the entries that it reads. The properties `RapidMessages` and `VolumeMessagesOfAnyStore` bind
+    // both to one description of it.
     [[nodiscard]] static std::vector<foundation::Dictionary>
     combineRapidMessages(const session::MessageStore& messages, std::span<const std::string_view> keysToCombine,
                          double maximumPausetime);
-    // One event for each stretch of more than so many seconds during which output ran unchanged. Without a process
-    // there are none. The share, which is empty, pays for them from now on, but for the first `unpaidVolumeEventBytes`.
-    // Events that would take more than `mostVolumeEventBytes` together, or more than the budget has, are lost, with a
-    // log line.
+    // One event for each stretch of more than `minimumPlaytime` seconds during which output ran unchanged. Without a
+    // process there are no events. The share, which must be empty, pays for them, except for the first
+    // `unpaidVolumeEventBytes`. Events beyond `mostVolumeEventBytes` together, or beyond the budget, are lost, and a
+    // log line says so.
     [[nodiscard]] static std::vector<foundation::Dictionary>
     createVolumeMessages(const session::MessageStore& messages, const std::optional<foundation::Value>& process,
                          double minimumPlaytime, session::StorageShare& share);
     static constexpr std::size_t mostVolumeEventBytes = std::size_t{64} << 20;
-    // One session ends at a time, so that a few events take nothing from anybody: a client that has used up its budget
-    // still learns what was played.
+    // A client that has used up its budget still gets the first few events of what it played. They take memory from no
+    // other client, because only one session ends at a time.
     static constexpr std::size_t unpaidVolumeEventBytes = std::size_t{64} << 10;
 
-    // Summary files of all sessions that are kept; beyond these the oldest go.
+    // The limit for the summary files of all sessions. Beyond it the oldest are removed.
     static constexpr std::size_t mostSummaryFiles = 4096;
     static constexpr std::uint64_t mostSummaryBytes = std::uint64_t{256} << 20; // of all together
 
-    // For every key of this run's messages all values that it took, joined by commas; nothing without messages. One
-    // that the budget has no room for is lost like a message, with a log line. Nothing is recorded meanwhile.
+    // For every key of this run's messages, all its values, joined by commas; nothing without messages. If the budget
+    // has no room for it, it is lost and logged like a message. Nothing may be recorded meanwhile.
     [[nodiscard]] std::optional<foundation::Dictionary> createSummaryEventForSession() const;
-    // On internal builds writes this run's messages to a file below the diagnostic-log root. What fails is logged.
+    // On internal builds, writes this run's messages to a file below the diagnostic-log root. A failure is logged.
     void writeSummaryJson() const;
 
-    // The reply of the call that started this run, kept by the client instance until its work is done.
+    // The reply of the call that started this run. The client instance keeps it here until the run's work is done.
     [[nodiscard]] const utility::ResultReply<bool>& transactionCompleteBlock() const
     {
         return transactionCompleteBlock_;
     }
     void setTransactionCompleteBlock(utility::ResultReply<bool> block) { transactionCompleteBlock_ = std::move(block); }
 
-    // What the drivers' channels held when the session started; set and cleared by the client instance. One that the
-    // budget has no room for is not kept, with a log line.
+    // What the drivers' channels held when the session started; the client instance sets and clears it. A snapshot for
+    // which the budget has no room is not kept, and a log line says so.
     [[nodiscard]] const std::optional<session::DriverSnapShot>& driverSnapShot() const { return driverSnapShot_; }
     void setDriverSnapShot(std::optional<session::DriverSnapShot> snapShot);
 
-    // Asked for by the client; kept for it and never read here.
+    // The client asks for it; this process keeps it and never reads it.
     [[nodiscard]] bool blinReportingEnabled() const { return blinReportingEnabled_; }
     void setBlinReportingEnabled(bool enabled) { blinReportingEnabled_ = enabled; }
 
-    // This run's messages, each a dictionary of one entry, identifier to payload; nothing while not started.
+    // This run's messages, each a dictionary of one entry, identifier to payload; nothing unless the session is
+    // started.
     [[nodiscard]] std::optional<std::vector<foundation::Dictionary>> nestedAggregatedPayloadData() const;
-    // By kind, how many messages this run accepted; nothing while not started.
+    // How many messages of each kind this run accepted; nothing unless the session is started.
     [[nodiscard]] std::optional<foundation::Dictionary> messageIdentifierCounts() const;
 
     // Constant answers.

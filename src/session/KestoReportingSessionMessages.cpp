@@ -1,4 +1,4 @@
-// Receiving a message: it is normalised, compared with the one before of its kind, and recorded.
+// A session's handling of a message: it normalises it, compares it with the previous one of its kind, and records it.
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"

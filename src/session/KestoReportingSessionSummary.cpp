@@ -1,5 +1,5 @@
-// The session's summary: every value that each key took, in one event, and on internal builds the whole message
-// store as a file that diagnostic tools read.
+// The session's summary: one event with every value of each key and, on internal builds, all messages in a file that
+// diagnostic tools read.
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "foundation/cbor/Cbor.h"
 #include "foundation/text/Format.h"
@@ -25,14 +25,14 @@ constexpr unsigned summaryDirectoryPermissions = 0777;
 
 // The texts of each key's values, joined by commas, in the order in which the keys first came.
 //
-// Clients choose how many keys there are and how long the texts become, and a text may be many times what its values
-// take in the store: what is gathered is paid from the budget while it is.
+// Clients choose the number of keys and the length of the texts, and a text may be many times longer than its values in
+// the store. So the budget pays for the texts while they exist.
 class ValuesByKey {
 public:
     explicit ValuesByKey(std::shared_ptr<session::StorageBudget> budget) : share_(std::move(budget)) { }
 
-    // Which of the texts is the key's. Keys come in the same order in nearly every message: the one behind the last
-    // is tried first. A sorted index otherwise: no choice of keys makes it slow.
+    // The position of the key's text. Nearly every message has the keys in the same order, so the key behind the last
+    // one is tried first. The fallback is a sorted index, which no choice of keys makes slow.
     std::size_t positionOf(std::string_view key)
     {
         if (const std::size_t next = last_ + 1; next < values_.size() && values_[next].key == key)
@@ -45,7 +45,7 @@ public:
         return values_.size() - 1;
     }
 
-    // What says the same as the last of the key is a repetition, which costs next to nothing.
+    // A value that repeats the key's last value costs next to nothing.
     void append(std::size_t position, foundation::CborItem value)
     {
         last_ = position;
@@ -59,10 +59,10 @@ public:
         values.last = value;
     }
 
-    // Whether the budget had too little memory, which makes all further work vain.
+    // Whether the budget had too little memory. All further work is then useless.
     [[nodiscard]] bool isOutOfMemory() const { return isOutOfMemory_; }
 
-    // Nothing when the budget had too little memory.
+    // Nothing if the budget had too little memory.
     std::optional<Dictionary> finish() &&
     {
         Dictionary::Entries entries;
@@ -82,9 +82,9 @@ private:
         foundation::StringBuilder text = {}; // with a comma behind each value
         std::size_t lastSize = 0; // of the last value's text, with its comma
         foundation::CborItem last = {};
-        std::size_t repetitions = 0; // of the last value that are still to be written
+        std::size_t repetitions = 0; // of the last value, not written yet
     };
-    static constexpr std::size_t bytesOfAKey = 256; // in all that knows it, here and in the dictionary
+    static constexpr std::size_t bytesOfAKey = 256; // all that a key takes, here and in the dictionary
     static constexpr std::size_t paidAtOnce = 4096;
 
     void appendText(Values& values, foundation::CborItem value)
@@ -120,16 +120,15 @@ private:
     }
 
     std::vector<Values> values_;
-    std::map<std::string_view, std::size_t>
-        positions_; // the keys are those of `values_`, whose characters stay in place
-    std::size_t last_ = 0; // the position of the value that came last
+    std::map<std::string_view, std::size_t> positions_; // the keys of `values_`; their characters stay in place
+    std::size_t last_ = 0; // the position of the previous value
     session::StorageShare share_;
     std::size_t used_ = 0;
     bool isOutOfMemory_ = false;
 };
 
-// What a client chose, made fit to be part of a file name: it cannot leave the directory, and whole characters of it
-// take no more bytes than there is room for.
+// Text of a client, made fit for a part of a file name: it cannot leave the directory, and it is cut between characters
+// so that it fits the room (bytes).
 std::string fileNamePart(std::string_view text, std::size_t room)
 {
     std::string part(foundation::cutBetweenCharacters(text, room));
@@ -139,7 +138,7 @@ std::string fileNamePart(std::string_view text, std::size_t room)
     return part;
 }
 
-// Whether it has the shape of the names that `summaryFileName` makes.
+// Whether the name has the shape of those that `summaryFileName` makes.
 bool isSummaryFileName(std::string_view name)
 {
     constexpr std::string_view shape = "dddddddd-dddddd+dddd-kesto-";
@@ -154,7 +153,7 @@ bool isSummaryFileName(std::string_view name)
         && name.ends_with(".json");
 }
 
-// What stands at a place of the payloads, as it was written last.
+// The entry at one place of the payloads, and its text as it was last written.
 struct WrittenEntry {
     std::string_view key;
     foundation::CborItem value = {}; // none while no text is kept
@@ -172,7 +171,7 @@ void writeEntry(foundation::PrettyJsonWriter& writer, WrittenEntry& entry, found
         entry = {.key = entry.key};
 }
 
-// An array of one-entry objects, identifier to payload. False when the store holds what JSON cannot say.
+// An array of objects with one entry, identifier to payload. False if the store holds a value that JSON cannot express.
 bool writeJson(const session::MessageStore& store, foundation::PrettyJsonWriter::Sink sink)
 {
     foundation::PrettyJsonWriter writer(std::move(sink));

@@ -1,4 +1,4 @@
-// The trace of a session: under which conditions one is run, from the parameters file that the configuration names.
+// The trace of a session: when a session is traced, with the parameters file that its configuration names.
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"

@@ -1,5 +1,5 @@
-// What a session's messages tell about its playing: the messages are replayed in order, and each stretch during
-// which output ran in one and the same way becomes a volume event.
+// What a session's messages say about its playing: the session replays them in order, and each stretch during which
+// output ran unchanged becomes a volume event.
 //
 // The switches of spatial audio arrive in bursts, which are folded into one payload first.
 #define KESTO_LOG_NAME "KestoReportingSession"
@@ -22,12 +22,12 @@ using Key = session::VolumeKey;
 constexpr std::string_view functionName = "+[KestoReportingSession createVolumeMessages:process:minimumPlaytime:]";
 constexpr double longestPause = 2.0; // seconds, within a burst
 
-// What of the state an event tells.
+// The parts of the state that an event contains.
 constexpr std::array keysOfAnEvent{
     Key::SelectedFormat,        Key::ActiveDevices, Key::Volume,          Key::SpatialAudioAccessoryFeature,
     Key::SpatializationEnabled, Key::RingerState,   Key::ChannelsPerFrame};
 
-// The keys of all events, once for all of them.
+// The keys of an event; all events share them.
 const foundation::Reference<foundation::DictionaryShape>& shapeOfEvents()
 {
     static const auto shape = foundation::DictionaryShape::make({
@@ -48,10 +48,10 @@ const foundation::Reference<foundation::DictionaryShape>& shapeOfEvents()
     return shape;
 }
 
-// The values in their order, the count still missing.
+// The values in their order, without the count.
 using ValuesOfEvent = std::array<Value, 13>;
 
-// What folding bursts needs to know of the payloads as the analysis sees them.
+// How folding reads, compares and merges payloads that the analysis reads.
 struct VolumePayloads {
     session::VolumeFieldsReader reader;
 
@@ -67,7 +67,7 @@ struct VolumePayloads {
     static void merge(Fields& into, const Fields& payload) { into.merge(payload); }
 };
 
-// The same of whole payloads, for any keys.
+// The same for whole payloads and any keys.
 struct WholePayloads {
     std::span<const std::string_view> keysToCombine;
 
@@ -123,7 +123,7 @@ public:
         merge(payload);
     }
 
-    // The events, each with their number. What they were made of goes as they come.
+    // The events, each with its number. The data that they are made of is freed on the way.
     std::vector<Dictionary> finish() &&
     {
         const std::size_t count = events_.size();
@@ -144,7 +144,7 @@ public:
     }
 
 private:
-    // A value of the state, and whether an event that has it was paid for.
+    // A value of the state, and whether an event with it has been paid for.
     struct Unpacked {
         Value value;
         bool isPaidFor = false;
@@ -184,7 +184,8 @@ private:
         state_.merge(payload);
     }
 
-    // Unpacked once, and shared by all events until it changes: a client may say once what a million events repeat.
+    // A value is unpacked once, and all events share it until it changes: a million events may repeat what a client
+    // said once.
     Unpacked& unpacked(Key key)
     {
         auto& unpacked = stateValues_[static_cast<std::size_t>(key)];
@@ -209,10 +210,10 @@ private:
                   "added volume message {{ func={}, action=add, count={} }}", functionName, events_.size());
     }
 
-    // What all take together has a bound. An event takes, in bytes: 224, a dictionary's object of 13 values; 8, its
-    // place in the list; twice 32, the texts of its buckets, as the allocator rounds them up. To that comes what the
-    // client said: in full with the first event that has it, and as text with all others, for though they share it in
-    // memory, it is written with each of them.
+    // All events together have a limit. An event takes, in bytes: 224 for a dictionary's object of 13 values; 8 for its
+    // place in the list; twice 32 for the texts of its buckets, as the allocator rounds them up. The client's values
+    // come on top: the first event with a value counts it in full. All others count only its text: they share it in
+    // memory, but each writes it out.
     bool makeRoomForEvent()
     {
         constexpr std::size_t bytesOfAnEvent = 224 + 8 + 2 * 32;
@@ -231,7 +232,7 @@ private:
         return true;
     }
 
-    // A place for each value is part of the event.
+    // Without the place of the value itself, which `bytesOfAnEvent` contains.
     [[nodiscard]] static std::size_t bytesBesideEvent(const Unpacked& unpacked)
     {
         const bool isTextOnly = unpacked.isPaidFor && unpacked.value.kind() == Value::Kind::String;

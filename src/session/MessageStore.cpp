@@ -1,4 +1,4 @@
-// How payloads are laid out behind each other, who pays for them, and what tells a repetition.
+// How payloads are laid out in memory, how they are paid for, and when a message is a repetition.
 #include "session/MessageStore.h"
 
 #include "foundation/cbor/Cbor.h"
@@ -12,18 +12,18 @@ namespace session {
 
 namespace {
 
-// Small sessions stay small, large ones get by with few allocations.
+// Small sessions stay small, and large ones need few allocations.
 constexpr std::size_t firstChunk = 512;
 constexpr std::size_t largestChunk = std::size_t{256} << 10;
 
-// A larger payload accepted last is decoded again when it is compared: it would take many times its bytes.
+// A larger last payload is decoded again for each comparison: decoded, it would take many times its bytes.
 constexpr std::size_t largestKeptDecoded = 1024;
 
-// Larger payloads are kept as they are: only what a session derives itself grows like that, and it need not be in
-// memory twice.
+// Larger payloads are kept unencoded: only payloads that a session derives itself grow so large, and a second copy
+// would waste memory.
 constexpr std::size_t largestEncoded = std::size_t{1} << 20;
 
-// Stamps that a client may add to any message; they say when, not what.
+// Stamps that a client may add to any message. They give its time, and nothing about its content.
 constexpr std::array<std::string_view, 3> timeStampKeys{"processuptime_ms", "systemuptime_sec", utility::timestampKey};
 
 // The characters of the payload's keys and strings, which is what makes a payload large.
@@ -66,7 +66,7 @@ MessageStore::Outcome MessageStore::record(AudioEventCategory category, AudioEve
     return Outcome::Recorded;
 }
 
-// What a kind has paid for once, it keeps for its next payloads, which take as much as a rule.
+// A kind keeps what it has paid for, because its next payloads usually take as much.
 bool MessageStore::payForDecoded(Kind& kind, std::size_t bytes)
 {
     if (kind.last.kept_ != nullptr || kind.last.encoded_.size() > largestKeptDecoded)
@@ -86,7 +86,7 @@ bool MessageStore::repeatsLast(const Kind& kind, const foundation::Dictionary& p
     return payload.isEqualIgnoring(kind.isLastDecoded ? kind.lastDecoded : kind.last.dictionary(), timeStampKeys);
 }
 
-// Messages come in runs of one kind, which is told by its numbers.
+// Messages come in runs of one kind. The numbers of category and type are the fast way to recognise it.
 std::optional<std::uint32_t> MessageStore::kindOf(AudioEventCategory category, AudioEventType type)
 {
     if (recent_ && recent_->category == category && recent_->type == type)
@@ -97,7 +97,7 @@ std::optional<std::uint32_t> MessageStore::kindOf(AudioEventCategory category, A
     return kind;
 }
 
-// Numbers that share their names are one kind. Nothing when there is no memory left for a new one.
+// Numbers with the same names are one kind. Nothing if the budget has no memory for a new kind.
 std::optional<std::uint32_t> MessageStore::kindNamedLike(AudioEventCategory category, AudioEventType type)
 {
     std::string key = KestoReportingUtilityCategoryString(category);
@@ -134,7 +134,7 @@ bool MessageStore::append(std::uint32_t kind, const foundation::Dictionary& payl
     return true;
 }
 
-// Room for so many bytes, or null pointer when the budget has no more.
+// Room for so many bytes, or null if the budget has no more.
 char* MessageStore::allocate(std::size_t bytes)
 {
     if (chunks_.empty() || chunks_.back().capacity - chunks_.back().used < bytes) {

@@ -1,9 +1,9 @@
 // The messages of one run of a session, in the order of acceptance, each under an identifier made of its kind
 // and a running number ("Volume_Summary_3").
 //
-// A session may record millions of messages, so they are kept encoded, one behind the other in large chunks, and
-// identifiers are not kept at all: the kind's number is, and the index follows from the order. What
-// decides on the next message is kept ready: per kind, the count and the payload accepted last.
+// A session may record millions of messages. So the store keeps them encoded, one behind the other in large chunks. It
+// keeps no identifiers: only the number of the kind, because the index follows from the order. For each kind it also
+// keeps the count and the last accepted payload, which decide about the next message.
 #pragma once
 
 #include "foundation/cbor/CborView.h"
@@ -23,7 +23,7 @@
 
 namespace session {
 
-// The owner keeps calls apart: one thread at a time.
+// One thread at a time, which the owner ensures.
 class MessageStore {
     // What stands before each payload in a chunk.
     struct Head {
@@ -35,7 +35,7 @@ class MessageStore {
 public:
     enum class Outcome : std::uint8_t {
         Recorded,
-        Redundant, // says the same as the message of its kind before it
+        Redundant, // repeats the previous message of its kind
         Full // the budget is used up; the message is lost
     };
 
@@ -44,14 +44,14 @@ public:
     public:
         [[nodiscard]] foundation::Dictionary dictionary() const;
 
-        // What is kept is one of the two: the encoding, or a large payload as it came (`EntryReader`).
+        // One of the two is set: the encoding, or a large payload as it came (see `EntryReader`).
         [[nodiscard]] std::string_view encoded() const noexcept { return encoded_; }
         [[nodiscard]] const foundation::Dictionary* kept() const noexcept { return kept_; }
 
     private:
         friend class MessageStore;
         std::string_view encoded_;
-        const foundation::Dictionary* kept_ = nullptr; // in place of the encoding, where it is large
+        const foundation::Dictionary* kept_ = nullptr; // for a large payload, in place of the encoding
     };
 
     struct Message {
@@ -65,24 +65,24 @@ public:
     MessageStore(const MessageStore&) = delete;
     MessageStore& operator=(const MessageStore&) = delete;
 
-    // Records the payload unless it repeats the one accepted last of its kind, time stamps aside. Errors
-    // (by category or type) are recorded even then.
+    // Records the payload unless it equals the last accepted one of its kind except for time stamps. Errors (by
+    // category or type) are recorded in any case.
     Outcome record(AudioEventCategory category, AudioEventType type, const foundation::Dictionary& payload);
 
     [[nodiscard]] std::size_t size() const noexcept { return size_; }
     [[nodiscard]] bool empty() const noexcept { return size_ == 0; }
-    // What it has paid for.
+    // The bytes that it has paid for.
     [[nodiscard]] std::size_t bytes() const noexcept { return share_.bytes(); }
 
-    // Goes over the messages in the order of acceptance; a copy goes on by itself from the same place. Valid as long
-    // as the store records nothing.
+    // Goes over the messages in the order of acceptance. A copy goes on independently from the same place. Valid as
+    // long as the store records nothing.
     class Cursor {
     public:
-        // Stands before the first message.
+        // Starts before the first message.
         explicit Cursor(const MessageStore& store) : store_(&store) { }
         // Goes to the next message; false when there is none.
         bool next();
-        // Of the message that it stands at.
+        // The kind of the message at which the cursor stands.
         [[nodiscard]] std::uint32_t kind() const { return head_.kind; }
         [[nodiscard]] Payload payload() const;
 
@@ -90,7 +90,7 @@ public:
         const MessageStore* store_;
         std::size_t chunk_ = 0;
         std::size_t at_ = 0; // in the chunk, behind the message
-        std::size_t keptAside_ = 0; // messages passed
+        std::size_t keptAside_ = 0; // messages kept aside that it passed
         Head head_ = {};
     };
 
@@ -113,7 +113,7 @@ private:
         bool isLastDecoded = false;
         std::size_t bytesForDecoded = 0; // paid for `lastDecoded`
     };
-    // What a kind takes beside its key and its payloads: itself, in a vector that doubles, and its place in the index.
+    // What a kind takes besides its key and payloads: itself, in a vector that doubles, and its place in the index.
     static constexpr std::size_t bytesOfAKind = 2 * sizeof(Kind) + 96;
     struct Recent {
         AudioEventCategory category;
@@ -139,7 +139,7 @@ private:
     std::deque<foundation::Dictionary> keptAside_;
     std::vector<Kind> kinds_;
     std::unordered_map<std::string, std::uint32_t> kindByKey_;
-    std::optional<Recent> recent_; // the kind of the message before this one
+    std::optional<Recent> recent_; // the kind of the previous message
     std::size_t size_ = 0;
 };
 

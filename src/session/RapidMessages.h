@@ -1,7 +1,7 @@
-// Bursts of messages a fraction of a second apart, as switches cause them, folded into one payload each.
+// Folds each burst of messages a fraction of a second apart, as switches cause them, into one payload.
 //
-// What of a message is read, and how two are merged, is left to the caller: the volume analysis needs a few entries of
-// a million messages, and has no use for the others.
+// The caller decides what is read of a message and how two are merged: the volume analysis needs only a few entries of
+// each of a million messages.
 #pragma once
 
 #include "session/MessageStore.h"
@@ -14,13 +14,13 @@
 
 namespace session {
 
-// Tells where one burst ends and the next begins. A pause is measured from the payload before, not from the
-// first of the burst; one without a time counts as 0, and leaves the next without anything to be measured from.
+// Finds where one burst ends and the next begins. A pause counts from the previous payload, not from the first of the
+// burst. A payload without a time counts as one at time 0; the payload after it never begins a burst.
 class MessageBursts {
 public:
     explicit MessageBursts(double maximumPausetime) : maximumPausetime_(maximumPausetime) { }
 
-    // Whether the next payload, of that time in seconds, begins a burst.
+    // Whether the next payload, with that time in seconds, begins a burst.
     bool beginsWith(std::optional<double> time)
     {
         const bool isPaused = lastTime_ && time.value_or(0) - *lastTime_ > maximumPausetime_;
@@ -36,15 +36,15 @@ private:
     std::optional<double> lastTime_;
 };
 
-// The payloads of the messages in order, which may be looked at before their turn. The next of those are kept until it
-// comes: every message is read twice at most, and once where bursts are close to each other.
+// The payloads of the messages, in order, with a look ahead. Payloads that the look ahead reads are kept until `next`
+// returns them; so every message is read at most twice, and once where bursts are close to each other.
 template <typename Payloads> class PayloadSequence {
 public:
     using Payload = decltype(std::declval<Payloads&>().read(std::declval<const MessageStore::Cursor&>()));
 
     PayloadSequence(const MessageStore& messages, Payloads& payloads) : cursor_(messages), payloads_(payloads) { }
 
-    // The next payload; nothing when there is none.
+    // The next payload, or nothing at the end.
     std::optional<Payload> next()
     {
         if (taken_ != kept_.size())
@@ -54,7 +54,7 @@ public:
         return cursor_.next() ? std::optional(payloads_.read(cursor_)) : std::nullopt;
     }
 
-    // Calls `visit` with the payloads that are still to come, until it returns false.
+    // Calls `visit` with the following payloads until it returns false.
     template <typename Visit> void lookAhead(Visit visit)
     {
         bool goesOn = std::all_of(kept_.begin() + static_cast<std::ptrdiff_t>(taken_), kept_.end(), visit);
@@ -71,13 +71,13 @@ public:
 private:
     static constexpr std::size_t mostKept = 256;
 
-    MessageStore::Cursor cursor_; // at the last message that was taken or is kept
+    MessageStore::Cursor cursor_; // at the last message that was taken or kept
     Payloads& payloads_;
-    std::vector<Payload> kept_; // behind those taken
-    std::size_t taken_ = 0; // of the kept
+    std::vector<Payload> kept_; // read ahead
+    std::size_t taken_ = 0; // of those in `kept_`
 };
 
-// Calls `visit` with the payloads of the messages in order, those of a burst as one at the place of the first of them.
+// Calls `visit` with the payloads of the messages, in order; a burst is one payload, at the place of its first message.
 //
 // `payloads` has the functions `read(cursor)`, `isCombinable(payload)`, `timeOf(payload)` and `merge(into, payload)`.
 template <typename Payloads, typename Visit>
@@ -88,7 +88,7 @@ void combineRapidMessages(const MessageStore& messages, double maximumPausetime,
     while (auto payload = sequence.next()) {
         if (payloads.isCombinable(*payload)) {
             if (!bursts.beginsWith(payloads.timeOf(*payload)))
-                continue; // is in the burst's payload already
+                continue; // already merged
             auto burstsAhead = bursts;
             sequence.lookAhead([&](const auto& member) {
                 if (!payloads.isCombinable(member))

@@ -1,4 +1,4 @@
-// A budget is a number that never exceeds its limit, and neither does that of the budget around it.
+// What is taken from a budget never exceeds its limit, nor that of the budget around it.
 #include "session/StorageBudget.h"
 
 namespace session {

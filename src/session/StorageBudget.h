@@ -1,7 +1,7 @@
-// How much memory may be taken by what clients have the service keep: one budget for the service, and within it one a
-// client, so that no client, and not all of them together, can fill the device's memory.
+// How much memory the service may use for what it keeps for clients. The service has one budget, and within it each
+// client has one, so that neither one client nor all of them together can fill the device's memory.
 //
-// Whoever keeps something for a client holds a share of its budget that grows and shrinks with it.
+// Code that keeps something for a client holds a share of the client's budget; the share grows and shrinks with it.
 #pragma once
 
 #include <atomic>
@@ -17,7 +17,7 @@ public:
     static constexpr std::size_t serviceLimit = std::size_t{2} << 30;
     static constexpr std::size_t clientLimit = std::size_t{1} << 30;
 
-    // A budget of so many bytes; what is taken from it is taken from `enclosing` too, when there is one.
+    // A budget of so many bytes. What is taken from it is also taken from `enclosing`, unless that is null.
     explicit StorageBudget(std::size_t limit, std::shared_ptr<StorageBudget> enclosing = nullptr)
         : limit_(limit),
           enclosing_(std::move(enclosing))
@@ -27,7 +27,7 @@ public:
     // The budget of the whole service.
     static const std::shared_ptr<StorageBudget>& service();
 
-    // False, and nothing taken, when there is not so much left here or in an enclosing budget.
+    // False, with nothing taken, if this or an enclosing budget has not so much left.
     [[nodiscard]] bool take(std::size_t bytes);
     void giveBack(std::size_t bytes);
     [[nodiscard]] std::size_t taken() const { return taken_.load(std::memory_order_relaxed); }
@@ -38,7 +38,7 @@ private:
     std::atomic<std::size_t> taken_{0};
 };
 
-// What is paid for one thing that is kept; it goes back to the budget when the share goes. One thread at a time.
+// What was paid for one thing that is kept. Its destructor returns it to the budget. One thread at a time.
 class StorageShare {
 public:
     explicit StorageShare(std::shared_ptr<StorageBudget> budget) : budget_(std::move(budget)) { }
@@ -47,7 +47,7 @@ public:
     StorageShare& operator=(const StorageShare&) = delete;
 
     [[nodiscard]] std::size_t bytes() const { return bytes_; }
-    // Pays for so many bytes more, or for so many in all; false, and nothing changed, when the budget has no more.
+    // Pays for so many further bytes, or for so many in all. False, with nothing changed, if the budget has no more.
     [[nodiscard]] bool grow(std::size_t bytes);
     [[nodiscard]] bool resize(std::size_t bytes);
     void shrink(std::size_t bytes);

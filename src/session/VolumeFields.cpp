@@ -1,4 +1,4 @@
-// Finding the fields among the entries of a message.
+// Finding the volume analysis's fields among the entries of a message.
 #include "session/VolumeFields.h"
 
 #include "foundation/cbor/Cbor.h"
@@ -21,7 +21,7 @@ constexpr std::array<std::string_view, static_cast<std::size_t>(Key::Count)> nam
                                                                                    "PomoSessionVolume",
                                                                                    "mChannelsPerFrame"};
 
-// By length first: nearly every key of a message is told apart by it.
+// The length comes first: it tells nearly all keys of a message apart.
 constexpr std::optional<Key> keyOf(std::string_view name)
 {
     const auto candidates = [&]() -> std::array<Key, 2> {
@@ -44,7 +44,7 @@ constexpr std::optional<Key> keyOf(std::string_view name)
     return std::nullopt;
 }
 
-// No name is forgotten in one of the two places.
+// Every key must stand in both tables.
 constexpr bool findsEveryKey()
 {
     for (std::size_t key = 0; key < names.size(); ++key)

@@ -1,6 +1,6 @@
-// The entries of a message that the volume analysis looks at, and nothing else of it.
+// The entries of a message that the volume analysis reads.
 //
-// They are left encoded, in the store's own memory: a session's end looks at every message, and unpacking them
+// They stay encoded, in the store's own memory: the end of a session looks at every message, and unpacking all of them
 // would cost more than the analysis.
 #pragma once
 
@@ -39,16 +39,16 @@ public:
     using Key = VolumeKey;
 
     [[nodiscard]] bool has(Key key) const { return !item(key).bytes().empty(); }
-    // The entry's value; null when there is none.
+    // The entry's value; null without one.
     [[nodiscard]] foundation::Value value(Key key) const { return has(key) ? item(key).value() : foundation::Value(); }
-    // The value as it counts where a number or a truth value is asked for.
+    // The value as a number, as it counts where a number or a truth value is expected.
     [[nodiscard]] foundation::Number number(Key key) const;
     [[nodiscard]] bool boolean(Key key) const;
-    // Whether both say the same of the key, told by the encoding alone.
+    // Whether both have the same value of the key; only the encodings are compared.
     [[nodiscard]] bool isSame(const VolumeFields& other, Key key) const { return item(key).isSameAs(other.item(key)); }
 
     void set(Key key, foundation::CborItem item) { items_[static_cast<std::size_t>(key)] = item; }
-    // Takes over all entries that the other has.
+    // Takes over all entries of the other.
     void merge(const VolumeFields& other);
 
 private:
@@ -57,11 +57,11 @@ private:
     std::array<foundation::CborItem, static_cast<std::size_t>(Key::Count)> items_;
 };
 
-// Reads the fields of payloads; they are valid as long as the reader and the store.
+// Reads the fields of payloads. They are valid as long as the reader and the store exist.
 class VolumeFieldsReader {
 public:
     [[nodiscard]] VolumeFields read(const MessageStore::Cursor& message);
-    // The value, encoded and kept here.
+    // Encodes the value and keeps it here.
     [[nodiscard]] foundation::CborItem keep(const foundation::Value& value);
 
 private:
