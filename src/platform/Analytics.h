@@ -1,4 +1,4 @@
-// The analytics-event service: keeps events whose names the device's configuration selects.
+// The analytics-event service: keeps the events that the device's configuration selects by name.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -18,10 +18,10 @@ public:
     virtual ~Analytics() = default;
     // Whether the device keeps events of that name now.
     [[nodiscard]] virtual bool isAnalyticsEventUsed(std::string_view eventName) = 0;
-    // Sends an event: in the turn, whose events are stored together when it ends, or outside any turn, at once. The
-    // events of one turn keep their order, and so do the events that one thread sends outside turns. The service calls
-    // the builder at most once, on any thread, when it needs the payload. It drops an unwanted event with its builder,
-    // and loses an event whose payload holds a number that is not finite.
+    // Sends an event. The events of a turn are stored together when it ends; an event outside any turn is stored as
+    // soon as possible. The events of one turn keep their order, and so do the events that one thread sends outside
+    // turns. The service calls the builder at most once, on any thread, when it needs the payload. It drops an unwanted
+    // event with its builder, and loses an event with a number that is not finite in its payload.
     virtual void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
     virtual void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
 };

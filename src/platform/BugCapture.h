@@ -41,8 +41,8 @@ public:
     using StateDescription = std::function<foundation::Value()>;
     virtual void setStateDescription(const StateDescription& /*describe*/) { }
 
-    // The process whose message the calling thread is handling, or 0. Several processes may share a name; a snapshot
-    // that is requested meanwhile is of this process.
+    // The process that sent the message which the calling thread is handling, or 0. Several processes may share a name;
+    // a snapshot that is requested meanwhile is of this process.
     [[nodiscard]] static std::int32_t currentSender() noexcept { return currentSender_; }
 
     // Makes a process the current sender of this thread while its message is being handled.

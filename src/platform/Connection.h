@@ -38,7 +38,7 @@ public:
 
     virtual ~Connection() = default;
 
-    // The connection whose call the calling thread is handling, or null; null also in the handlers of its end.
+    // The connection from which the calling thread is handling a call, or null; null also in the handlers of its end.
     [[nodiscard]] static const Connection* current() noexcept { return current_; }
 
     // Makes a connection the current one of this thread while its calls are being handled.

@@ -1,4 +1,4 @@
-// Events on their way to what keeps them, written out as they will stand there.
+// Events on their way to the keeper, written in the form in which it stores them.
 //
 // A payload becomes JSON when its event is added, on the thread that built it: taken apart on another thread, every
 // string that it shares with other messages would wander between two processors. Only a large payload waits for the
@@ -16,7 +16,7 @@
 
 namespace platform {
 
-// One event as it is kept.
+// One event in its stored form.
 struct EventRow {
     double time = 0; // seconds since 1970 UTC
     std::string_view name;
@@ -39,8 +39,7 @@ public:
     [[nodiscard]] std::size_t size() const noexcept { return events_.size(); }
     [[nodiscard]] std::size_t bytes() const noexcept;
 
-    // The events in their order, without those whose payload holds what JSON cannot say. Valid until the batch
-    // changes.
+    // The events in their order, without those with a payload that JSON cannot express. Valid until the batch changes.
     [[nodiscard]] std::span<const EventRow> rows();
 
 private:
@@ -55,7 +54,7 @@ private:
     };
     struct Payload {
         Text json; // empty where there is none
-        foundation::Dictionary waiting; // to become JSON
+        foundation::Dictionary waiting; // becomes JSON in `rows`
     };
 
     [[nodiscard]] Text write(const foundation::Dictionary& payload);

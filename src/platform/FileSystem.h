@@ -43,8 +43,7 @@ public:
     // if a file is in the way.
     [[nodiscard]] virtual std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
                                                                                  unsigned permissions) = 0;
-    // Begins a file in an existing folder. Several unfinished files may have one name: the one that is committed last
-    // stays.
+    // Begins a file in an existing folder. Several unfinished files may have one name: the last committed one stays.
     [[nodiscard]] virtual std::expected<std::unique_ptr<AtomicFile>, std::error_code>
     createAtomically(const std::filesystem::path& path) = 0;
     // Reports that a file of that kind, with so many bytes, was added to the folder: if the folder now holds too many,

@@ -26,7 +26,7 @@ struct KernelTraceEvent {
     std::uint32_t eventCode = 0;
     std::uint32_t cpu = 0;
     KernelTraceWallTime wallTime{}; // 0 in sessions that did not enable it
-    std::array<const char*, 2> texts{}; // for systems whose events carry text and a number beside their arguments
+    std::array<const char*, 2> texts{}; // for systems that add texts and a number to the arguments
     std::int32_t value = 0;
 };
 static_assert(sizeof(void*) != 8 || sizeof(KernelTraceEvent) == 96);
@@ -42,8 +42,8 @@ public:
     virtual void setCompletionHandler(std::function<void()> handler) = 0;
     // Whether events carry their wall-clock time; by default they do not. Call this before `start`.
     virtual void enableWallTimes(bool enabled) = 0;
-    // Every handler whose range holds the event's code gets the event. Both codes are in the range. Returns 0, or an
-    // error number for an empty range, for an empty handler, and after `start`.
+    // Every handler gets the events with codes in its range, which includes both codes. Returns 0, or an error number
+    // for an empty range, for an empty handler, and after `start`.
     virtual int filterEventRange(std::uint32_t firstCode, std::uint32_t lastCode,
                                  std::function<void(const KernelTraceEvent&)> handler) = 0;
     // Returns 0, or an error number without a queue, for a session that was started before, and if the system refuses.

@@ -25,8 +25,9 @@ public:
         return letters_.back().frames;
     }
 
-    // Takes all letters. What is returned has each connection write its own, from the thread that calls it; those of
-    // several turns must be called one after the other, in the order of the turns. It is empty when there are none.
+    // Takes all letters. The returned function makes each connection write its letter, on the calling thread; the
+    // functions of several turns must be called one after the other, in the order of the turns. It is empty without
+    // letters.
     [[nodiscard]] std::move_only_function<void()> take();
 
 private:
@@ -37,7 +38,7 @@ private:
 
     [[nodiscard]] static std::vector<Letter> merged(std::vector<Letter> letters);
 
-    std::vector<Letter> letters_; // one answer after the other for the same connection makes one letter already
+    std::vector<Letter> letters_; // successive answers for one connection already share a letter
 };
 
 } // namespace platform

@@ -79,7 +79,7 @@ class Log {
 public:
     virtual ~Log() = default;
     [[nodiscard]] virtual LogLevel threshold(const LogCategory& category) const = 0;
-    // Writes the line in any case: callers check the threshold before.
+    // Writes the line in any case: callers check the threshold first.
     virtual void write(const LogRecord& record) = 0;
 };
 
@@ -90,7 +90,7 @@ public:
 void writeFormattedLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,
                        fmt::format_args arguments);
 
-// The same, with the arguments checked against the format when it is compiled.
+// The same; the compiler checks the arguments against the format.
 template <typename... Arguments>
 void writeLog(const LogCategory& category, LogLevel level, LogLocation location,
               fmt::format_string<Arguments...> format, Arguments&&... arguments)

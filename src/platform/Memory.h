@@ -9,8 +9,8 @@ namespace platform {
 class Memory {
 public:
     virtual ~Memory() = default;
-    // Tells that so many bytes which had gathered for clients are free. Once they are much, the system gets them back,
-    // seconds later: until then, the next session may use them.
+    // Reports that so many bytes which had gathered for clients are free. Once the sum is large, the system gets them
+    // back some seconds later; until then the next session may use them.
     virtual void letGo(std::size_t bytes) = 0;
 };
 

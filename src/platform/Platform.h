@@ -53,7 +53,7 @@ void uninstall();
 [[nodiscard]] bool isInstalled() noexcept;
 
 // The number of installations so far. State that is kept "once for the life of the process" is kept for one
-// installation, so that each test starts anew.
+// installation, so that tests do not share it.
 [[nodiscard]] std::uint64_t installationNumber() noexcept;
 
 } // namespace platform

@@ -21,7 +21,7 @@ public:
     [[nodiscard]] virtual std::string ownProcessName() const = 0;
     // The entry of that process, which may be this one, or nothing if it does not exist. May be a moment old.
     [[nodiscard]] virtual std::optional<ProcessTableEntry> entry(std::int32_t processIdentifier) const = 0;
-    // Drops the cached entry of that process: the next `entry` reads it anew.
+    // Drops the cached entry of that process, so that the next `entry` reads it again.
     virtual void forget(std::int32_t /*processIdentifier*/) { }
 };
 

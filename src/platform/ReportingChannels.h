@@ -84,9 +84,8 @@ public:
     // The present channels of the group and subgroup, including those that came after the subscription.
     virtual std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
                                                                                 const ChannelSet& channels) = 0;
-    // The increase of each channel's counters up to the later sample; a new channel, or one whose counters began anew,
-    // counts with its whole content. Extremes are those of the later sample, and a duty cycle is the share of the
-    // difference.
+    // The increase of each channel's counters up to the later sample; a new or restarted channel counts with its whole
+    // content. Extremes are those of the later sample, and a duty cycle is the share of the difference.
     virtual std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,
                                                                                    const ReportingSample& to) = 0;
 };

@@ -1,8 +1,8 @@
-// What one turn of the server queue gathers: the events to be kept, and the letters that leave once they are.
+// What one turn of the server queue gathers: events for the store, and the letters that leave when the events are kept.
 //
-// A turn is made by its queue (see TurnQueue) and reaches everything that adds to it by reference: a function that
-// takes a turn can send events and answers, and one that takes none cannot. When the turn is over, the platform takes
-// what it gathered, as a whole, and the next turn begins empty.
+// A queue makes its turn (see TurnQueue), and passes it by reference to everything that adds to it: a function that
+// takes a turn can send events and answers, and one that takes none cannot. At the end of the turn, the platform takes
+// everything that it gathered, and the next turn begins empty.
 #pragma once
 
 #include "platform/EventBatch.h"
@@ -16,7 +16,7 @@ struct Turn {
     Letters letters; // see Connection
 };
 
-// In the place of a turn: there is none, so what is sent does not wait for the end of one.
+// Stands in for a turn: what is sent outside any turn does not wait for an end.
 struct OutsideTurn { };
 inline constexpr OutsideTurn outsideTurn;
 

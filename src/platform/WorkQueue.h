@@ -1,17 +1,19 @@
-// Work queues: a serial queue a name, the background concurrent queue, and work that starts later.
+// Work queues: named serial queues, the background concurrent queue, and work that starts later.
 //
-// Order: a serial queue runs one item at a time, in the order in which they were submitted. What an item holds is let
-// go of on the queue, before the next item runs. The concurrent queue promises no order.
+// Order: a serial queue runs one item at a time, in the order in which they were submitted. It releases an item, on the
+// queue, before it runs the next. The concurrent queue promises no order.
 //
-// Memory: an item sees what its submitter did before it submitted it, and an item of a serial queue also what all items
-// before it did, on whichever thread each of them ran. So what only the items of one serial queue touch needs no lock.
+// Memory: an item sees everything that its submitter did before submitting it. An item of a serial queue also sees
+// everything that all earlier items did, on any thread. So data that only the items of one serial queue use needs no
+// lock.
 //
-// Threads: items belong to their queue, not to a thread. A queue that may be helped has its items run by its own thread
-// or by a thread that submitted some and offers its help, which then also runs what others submitted. So nothing that
-// an item needs may be thread-local, and a thread that helps holds no lock while it submits to such a queue, nor when
-// it would sleep: an item that takes the same lock might run on that very thread. Debug builds end where it holds one.
+// Threads: items belong to their queue, not to a thread. If a queue may be helped, its items run on its own thread or
+// on a thread that submitted some and offers its help; that thread then also runs items of other submitters. So nothing
+// that an item needs may be thread-local. A thread that helps must hold no lock while it submits to such a queue or
+// when it would sleep, because an item that takes the same lock might run on that very thread. Debug builds end the
+// process if it holds one.
 //
-// No queue polls; one that is empty has a sleeping thread, or none.
+// No queue polls. An empty queue has a sleeping thread, or none.
 #pragma once
 
 #include "platform/Turn.h"
@@ -29,7 +31,7 @@ using TurnItem = std::move_only_function<void(Turn& turn)>;
 
 enum class QualityOfService : std::uint8_t { UserInteractive, Default, Background };
 
-// A queue that is let go, be it by one of its own items, still runs what was submitted before. Any thread may submit.
+// A queue that is destroyed, even by one of its own items, still runs what was submitted before. Any thread may submit.
 class WorkQueue {
 public:
     virtual ~WorkQueue() = default;
@@ -66,18 +68,19 @@ public:
 class WorkQueues {
 public:
     virtual ~WorkQueues() = default;
-    // Both throw std::system_error when there is no thread left for the queue.
+    // Both throw std::system_error if the system refuses a thread for the queue.
     [[nodiscard]] virtual std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name,
                                                                      SerialQueueOptions options) = 0;
     [[nodiscard]] virtual std::shared_ptr<TurnQueue> makeTurnQueue(std::string_view name,
                                                                    SerialQueueOptions options) = 0;
-    // The process's concurrent queue of background priority. It runs a few items side by side: one that waits for
-    // another may wait for ever.
+    // The process's concurrent queue of background priority. It runs a few items side by side; so an item that waits
+    // for another may wait for ever.
     [[nodiscard]] virtual WorkQueue& backgroundQueue() = 0;
-    // Submits the item to the queue after the delay, or at once if that is not positive; those of one moment in the
-    // order in which they came. The queue must outlive that moment.
+    // Submits the item to the queue after the delay, or immediately if the delay is not positive. Items for the same
+    // moment keep the order in which they came. The queue must outlive that moment.
     //
-    // What this or the background queue has no thread for is not lost: it waits until more comes.
+    // If neither this nor the background queue can get a thread, items are not lost: they wait until a later item gets
+    // one.
     virtual void submitAfter(std::chrono::nanoseconds delay, WorkQueue& queue, WorkItem item) = 0;
     [[nodiscard]] virtual std::unique_ptr<Semaphore> makeSemaphore(unsigned initialCount) = 0;
 };

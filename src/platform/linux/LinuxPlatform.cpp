@@ -7,8 +7,8 @@
 namespace platform {
 namespace {
 
-// By which notification the owner of a preferences domain tells that it changed. Domains that tell nothing have the
-// empty name, under which nothing can be registered.
+// The notification by which the owner of a preferences domain reports a change. Other domains have the empty name,
+// which cannot be registered.
 std::string_view notificationOf(std::string_view domain)
 {
     if (domain == "com.quarn.kesto")

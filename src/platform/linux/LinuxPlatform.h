@@ -37,7 +37,7 @@ public:
     explicit LinuxPlatform(const LaunchConfiguration& launch);
 
     [[nodiscard]] Platform platform();
-    // Not part of the bundle: it counts kept and lost events, and can write all sent events at once.
+    // Not part of the bundle: it counts kept and lost events, and can write all sent events immediately.
     [[nodiscard]] AnalyticsStore& analyticsStore() noexcept { return analytics_; }
     // For the start: see LinuxFileSystem.
     void removeUnfinished(const std::filesystem::path& folder) { fileSystem_.removeUnfinished(folder); }

@@ -30,7 +30,7 @@ constexpr mode_t permissions = 0750; // of folders: only the service's user and 
 
 constexpr std::size_t everything = std::numeric_limits<std::size_t>::max();
 
-// Hidden names are those of folders that are coming or going.
+// Folders have hidden names while they are made or removed.
 constexpr std::string_view coming = ".new";
 constexpr std::string_view going = ".old";
 

@@ -47,7 +47,7 @@ public:
         std::filesystem::path proc = "/proc"; // processes and the sound system
     };
 
-    // Writes below the state directory. Removes the unfinished snapshots of a killed service at once.
+    // Writes below the state directory. Its constructor removes the unfinished snapshots of a killed service.
     LinuxBugCapture(const std::filesystem::path& stateDirectory, Sources sources, ProviderLog log,
                     const Limits& limits);
     LinuxBugCapture(const std::filesystem::path& stateDirectory, Sources sources, ProviderLog log)
@@ -69,7 +69,7 @@ private:
         foundation::Value event;
         foundation::Value payload;
         BugCaptureReporter::Reply reply;
-        std::int32_t sender = 0; // the process whose message caused it; 0 if unknown
+        std::int32_t sender = 0; // the process that sent the message; 0 if unknown
         foundation::Value state = {}; // of the requesting program
     };
 

@@ -16,7 +16,7 @@ namespace platform {
 // Any thread.
 class ChannelComplaints {
 public:
-    // How many missing channels are named at once; the others are counted.
+    // How many missing channels one reading names; the others are counted.
     static constexpr std::size_t mostNamed = 16;
 
     // The result of one reading.
@@ -40,7 +40,7 @@ public:
     void tell(Findings found, const Memory& memory);
     // Logs that the tree could not be read, and keeps its earlier findings until it can be read.
     void tellUnreadable(std::error_code error, const Memory& memory);
-    // Forgets the findings of queries whose owners are gone.
+    // Forgets the findings of queries without owners.
     void forgetDroppedQuestions();
 
 private:

@@ -12,7 +12,7 @@
 //     sub0 format     state    the format, such as S16_LE/48000/2, and for how long the stream has been running
 //
 // A stream that is not open has pointers of 0 and neither state nor format. The kernel reports since when a stream is
-// in its state, but no earlier states: so the channel has one state, entered once, and after a change it counts anew.
+// in its state, but no earlier states: so the channel has one state, entered once, which starts at 0 after a change.
 // Times are milliseconds, and are missing for programs that do not ask for time stamps.
 #pragma once
 

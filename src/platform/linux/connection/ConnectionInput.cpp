@@ -1,4 +1,4 @@
-// All that a frame must be before anybody looks for a call in it.
+// The checks that every frame passes before the connection looks for a call in it.
 #include "platform/linux/connection/ConnectionInput.h"
 
 #include <fmt/format.h>

@@ -1,4 +1,4 @@
-// What one connection reads: bytes as they come, cut into frames and decoded.
+// The input of one connection: bytes in order of arrival, which it cuts into frames and decodes.
 #pragma once
 
 #include "foundation/cbor/Cbor.h"
@@ -21,11 +21,11 @@ public:
         std::size_t size; // of its encoding
     };
 
-    // The bytes are valid until all their frames were taken.
+    // The bytes must stay valid until all their frames were taken.
     void feed(std::string_view bytes) { reader_.feed(bytes); }
-    // The next frame; nothing when it is not complete; or what is wrong with it, after which there are no more.
+    // The next frame, or nothing until it is complete. On an error, what is wrong with it; the input then ends.
     [[nodiscard]] std::expected<std::optional<Frame>, Connection::Violation> next();
-    // Whether a part of a frame came, and its end did not.
+    // Whether only a part of a frame has come.
     [[nodiscard]] bool isInsideFrame() const { return reader_.isInsideFrame(); }
 
 private:

@@ -1,4 +1,4 @@
-// What is written stays in front of the rest until moving the rest costs less than sending did.
+// Written bytes stay at the front of the buffer until moving the rest costs less than sending them did.
 #include "platform/linux/connection/ConnectionOutput.h"
 
 #include <array>
@@ -11,7 +11,7 @@
 namespace platform {
 namespace {
 
-// Sends what the socket takes, and the descriptors with the first byte.
+// Sends what the socket accepts, and the descriptors with the first byte.
 ssize_t sendWithDescriptors(int socket, std::string_view bytes, const EmitterDescriptors& descriptors)
 {
     const std::array numbers{descriptors.marker, descriptors.page};
@@ -56,8 +56,8 @@ std::optional<std::size_t> ConnectionOutput::writeTo(int socket)
     return taken;
 }
 
-// Descriptors go with the first byte of their frame. When the system has none to spare, because clients do not take
-// theirs, the frame goes without.
+// Descriptors go with the first byte of their frame. If the system has none to spare, because clients do not take
+// theirs, the frame goes without them.
 ssize_t ConnectionOutput::sendTo(int socket)
 {
     std::string_view rest = std::string_view(bytes_).substr(start_);

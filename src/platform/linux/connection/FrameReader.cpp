@@ -1,4 +1,4 @@
-// Two cases: a frame that lies whole in what was fed, which is the rule, and one that began in an earlier read.
+// There are two cases: usually a frame lies whole in the fed bytes; otherwise it began in an earlier read.
 #include "platform/linux/connection/FrameReader.h"
 
 #include <algorithm>
@@ -70,7 +70,7 @@ std::expected<std::optional<std::string_view>, FrameError> FrameReader::complete
     return std::string_view(cutOff_).substr(frameHeadSize);
 }
 
-// Moves what was fed behind what is held, until that many bytes are held.
+// Moves fed bytes behind the held ones, until it holds so many.
 void FrameReader::takeOver(std::size_t wanted)
 {
     if (cutOff_.size() >= wanted)

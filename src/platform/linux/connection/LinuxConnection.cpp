@@ -1,5 +1,4 @@
-// One lock a connection, for what it has to write and for how it ends; what only the connection thread touches needs
-// none.
+// Each connection has one lock, for its output and for its end. What only the connection thread uses needs no lock.
 #include "platform/linux/connection/LinuxConnection.h"
 
 #include "foundation/cbor/Cbor.h"
@@ -39,7 +38,7 @@ constexpr bool areTooManyUnanswered(std::uint64_t unanswered) noexcept
 
 } // namespace
 
-// What a call holds until it is answered.
+// The room that a call takes of the limits until it is answered.
 class LinuxConnection::Credit {
 public:
     Credit(std::shared_ptr<LinuxConnection> connection, std::size_t bytes) noexcept
@@ -99,8 +98,8 @@ bool LinuxConnection::isBrokenOff()
     return breakReason_.has_value();
 }
 
-// After all that may have happened: ends the connection if it broke, else waits for what comes next. Whether it
-// goes on.
+// Ends the connection if it broke or the peer closed it; otherwise watches for what comes next. Call it after
+// everything that can break the connection. Whether the connection goes on.
 bool LinuxConnection::settle()
 {
     std::optional<std::string> reason;
@@ -112,14 +111,14 @@ bool LinuxConnection::settle()
             watch();
             return true;
         }
-        reason = breakReason_; // which counts also when the peer closed at the same moment
+        reason = breakReason_; // it counts even if the peer closed at the same moment
     }
     end(std::move(reason));
     return false;
 }
 
-// One read, so that every client gets its turn. It happens also when the client is behind but gone: what it
-// left in the socket has an end, and the connection would otherwise never get to see it.
+// Reads once, so that every client gets its turn. It also reads from a client that is behind but gone: the bytes left
+// in the socket are limited, and only behind them does the connection find its end.
 void LinuxConnection::read()
 {
     auto& buffer = hub_->readBuffer;
@@ -140,8 +139,8 @@ void LinuxConnection::endOfStream()
         peerIsDone_ = true;
 }
 
-// Everything is decoded before anything is delivered: delivering alone is so quick that the queue which the
-// calls go to wakes up once and finds them all.
+// Decodes all frames before it delivers the first call: deliveries in quick succession wake the queue only once, which
+// then finds all calls.
 void LinuxConnection::takeIn(std::string_view bytes)
 {
     input_.feed(bytes);
@@ -186,8 +185,8 @@ std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
     return result;
 }
 
-// Not one of the service's calls: it is about the connection's own means, and no other part of the service learns of
-// it. Once a connection, so that nobody can have the service keep requests or descriptors in any number.
+// This request is not a call of the service: it concerns only the connection, and no other part of the service sees it.
+// Each connection may ask once, so that no client can make the service keep many requests or descriptors.
 std::expected<void, Connection::Violation> LinuxConnection::askForTraceMarker(const foundation::Value& call)
 {
     const auto number = call.exactly<std::uint64_t>();
@@ -204,7 +203,7 @@ std::expected<void, Connection::Violation> LinuxConnection::askForTraceMarker(co
     return {};
 }
 
-// Ahead of what a turn of the server queue holds back: nothing is kept for this answer.
+// This answer does not wait for a turn of the server queue, because no event has to be kept for it.
 void LinuxConnection::handOver(std::uint64_t call, const EmitterDescriptors& descriptors)
 {
     std::string frame;
@@ -248,8 +247,8 @@ void LinuxConnection::write(std::string frames)
     const foundation::Lock lock(lock_);
     if (isOver_ || breakReason_ || cannotSend_) {
         drop(frames.size());
-        watch(); // it is less behind now, and may still be read from
-    } else if (!output_.empty()) { // the socket has no room: the connection thread goes on when it has
+        watch(); // it is less behind now, so reading may go on
+    } else if (!output_.empty()) { // the socket is full: the connection thread goes on when there is room
         output_.append(std::move(frames));
         watch();
     } else {
@@ -258,14 +257,13 @@ void LinuxConnection::write(std::string frames)
     }
 }
 
-// Gives the socket what it takes.
 void LinuxConnection::writeOutput()
 {
     if (isOver_ || output_.empty())
         return;
     if (const auto taken = output_.writeTo(socket_.get())) {
         unsentBytes_ -= *taken;
-    } else { // reading goes on: what the peer sent before is still there
+    } else { // reading goes on, because earlier bytes of the peer are still there
         cannotSend_ = true;
         drop(output_.drop());
     }
@@ -284,8 +282,8 @@ bool LinuxConnection::isBehind() const noexcept
     return areTooManyUnanswered(unanswered_) || unsentBytes_ > manyUnsentBytes;
 }
 
-// Has the socket watched for what can be done with it now. Everyone who changes what it depends on calls it
-// afterwards; whoever comes last sees all changes.
+// Makes epoll watch the socket for what the connection can do now. Every function calls it after a change of what it
+// reads; so the last call sees all changes.
 void LinuxConnection::watch()
 {
     if (!isResumed_ || isOver_)
@@ -307,7 +305,7 @@ void LinuxConnection::watch()
     ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_MOD, socket_.get(), &event);
 }
 
-// Marks the connection as broken. The connection thread ends it, woken by the shutdown.
+// Marks the connection as broken, and shuts it down. This wakes the connection thread, which ends it.
 void LinuxConnection::breakOff(std::string reason)
 {
     const foundation::Lock lock(lock_);
@@ -328,7 +326,7 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
         isOver_ = true;
         drop(output_.drop());
         readingPauses = readingPauses_;
-        if (isResumed_) // closing does not suffice when a child process happens to hold a copy
+        if (isResumed_) // closing is not enough while a child process holds a copy
             ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_DEL, socket_.get(), nullptr);
         socket_ = FileDescriptor();
     }
@@ -345,7 +343,7 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
     }
     if (invalidationHandler_)
         invalidationHandler_();
-    // Only now: the call handler holds what the other two end, and all of them may hold the connection.
+    // Only after both calls: the call handler owns what they end, and every handler may own the connection.
     callHandler_ = nullptr;
     interruptionHandler_ = nullptr;
     invalidationHandler_ = nullptr;

@@ -1,12 +1,13 @@
 // A connection to one client over a Unix stream socket.
 //
-// The connection thread reads: whatever has come in, up to a buffer that all connections share, is cut into
-// frames, decoded, and delivered at once. Any thread writes: it tries the socket itself, and only what a slow
-// peer leaves over waits for the connection thread to be told that there is room again.
+// The connection thread reads: it takes what has come in, up to a buffer that all connections share, cuts it into
+// frames, decodes them, and delivers their calls immediately. Any thread writes: it tries the socket itself. Only what
+// a slow peer does not take waits until the connection thread finds room in the socket again.
 //
-// Every client is taken for hostile. One that breaks the protocol ends its own connection, with one line in the
-// log. One that asks faster than it is answered, or that does not read its answers, is not read from until it
-// is less behind; one that then still has far too much unread is cut off. What that cost is said when it ends.
+// Every client is treated as hostile. If one breaks the protocol, its own connection ends, with one line in the log. If
+// it asks faster than it gets answers, or does not read its answers, the connection stops reading from it until it is
+// less behind; if even then far too many answers are unread, the connection ends. At the end the log says what this
+// cost.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -27,15 +28,15 @@ namespace platform {
 
 class LinuxConnection final : public Connection, public std::enable_shared_from_this<LinuxConnection> {
 public:
-    // Beyond either, no more is read from the client, so one read may exceed it. A client may have 10,000 sessions,
-    // each with a start that stays unanswered until it is stopped: the number is far above that.
+    // Beyond either limit, the connection stops reading from the client; so one read may exceed it. A client may have
+    // 10,000 sessions, and the start of each is unanswered until the session stops: the number is far above that.
     static constexpr std::uint32_t mostUnansweredCalls = 32 * 1024;
     static constexpr std::uint32_t mostUnansweredBytes = 1024 * 1024;
-    // Beyond the first, no more is read from the client; beyond the second, it is cut off.
+    // Beyond the first limit, the connection stops reading from the client; beyond the second, it ends.
     static constexpr std::size_t manyUnsentBytes = 8 * 1024 * 1024;
     static constexpr std::size_t mostUnsentBytes = 32 * 1024 * 1024;
 
-    // Who is at the other end.
+    // The process at the other end.
     struct Peer {
         std::int32_t processIdentifier = 0;
         std::uint32_t userIdentifier = 0;
@@ -54,8 +55,8 @@ public:
     void send(Turn& turn, std::string frame) override;
     void write(std::string frames) override;
 
-    // Does what the events of the socket (of epoll) ask for. False when the connection is over, which it is to be
-    // forgotten for. Connection thread.
+    // Handles events of the socket (those of epoll). False if the connection is over, so that the listener forgets it.
+    // Connection thread.
     [[nodiscard]] bool handle(std::uint32_t events);
 
     // Ends the connection, with its handlers. Connection thread.
@@ -85,28 +86,28 @@ private:
     const std::shared_ptr<ConnectionHub> hub_;
     const Peer peer_;
 
-    // The connection thread's.
+    // Only for the connection thread.
     CallHandler callHandler_;
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;
     ConnectionInput input_;
-    bool peerIsDone_ = false; // it closed its side, between two frames
+    bool peerIsDone_ = false; // it closed its side between two frames
     bool hasAskedForTraceMarker_ = false;
 
-    // How far behind the client is.
+    // How far the client is behind.
     std::atomic<std::uint64_t> unanswered_; // calls in the upper half, their bytes in the lower half
-    std::atomic<std::size_t> unsentBytes_; // from `send` until the socket took them
-    std::atomic<std::uint64_t> droppedBytes_; // of answers that it will not get
+    std::atomic<std::size_t> unsentBytes_; // from `send` until the socket accepts them
+    std::atomic<std::uint64_t> droppedBytes_; // of answers that the client will not get
 
     foundation::Mutex lock_;
-    FileDescriptor socket_; // read from without the lock, for only the connection thread closes it, under the lock
-    ConnectionOutput output_ KESTO_GUARDED_BY(lock_); // what the socket did not take yet
+    FileDescriptor socket_; // read without the lock: only the connection thread closes it, under the lock
+    ConnectionOutput output_ KESTO_GUARDED_BY(lock_); // what the socket has not accepted yet
     std::uint32_t watchedEvents_ KESTO_GUARDED_BY(lock_) = 0;
     std::uint64_t readingPauses_ KESTO_GUARDED_BY(lock_) = 0;
     std::optional<std::string> breakReason_ KESTO_GUARDED_BY(lock_);
     bool isResumed_ KESTO_GUARDED_BY(lock_) = false;
     bool isOver_ KESTO_GUARDED_BY(lock_) = false;
-    bool cannotSend_ KESTO_GUARDED_BY(lock_) = false; // the peer takes nothing any more
+    bool cannotSend_ KESTO_GUARDED_BY(lock_) = false; // the peer accepts no more bytes
 };
 
 } // namespace platform

@@ -1,5 +1,5 @@
-// One loop around epoll. Accepting is part of it, in small helpings, and pauses when descriptors run out, so that
-// neither many new clients nor too many take anything from those that are there.
+// One loop around epoll. It accepts a few clients at a time, and pauses when descriptors run out, so that neither many
+// new clients nor too many clients harm those that are connected.
 #include "platform/linux/connection/LinuxConnectionListener.h"
 
 #include "platform/linux/files/SystemError.h"
@@ -19,7 +19,7 @@
 namespace platform {
 namespace {
 
-constexpr int mostAcceptedAtOnce = 16; // so that the clients which are there get their turn
+constexpr int mostAcceptedAtOnce = 16; // so that connected clients get their turn
 constexpr std::size_t mostEventsAtOnce = 64;
 
 std::size_t mostConnections()
@@ -80,7 +80,7 @@ void LinuxConnectionListener::resume()
         connection->invalidate();
 }
 
-// What little the clients ask for is done by this thread once it has read all that is there.
+// When this thread has read everything, it helps with the calls of the clients, if they are few.
 void LinuxConnectionListener::serve()
 {
     SerialQueue::Helper helper;
@@ -108,7 +108,7 @@ void LinuxConnectionListener::wake()
     ::eventfd_write(wake_.get(), 1);
 }
 
-// In milliseconds, as epoll counts; rounded up, so that nothing is found too early.
+// In milliseconds, as epoll counts; rounded up, so that the loop does not wake too early.
 int LinuxConnectionListener::waitingTime() const
 {
     if (!acceptAgainAt_)
@@ -121,7 +121,7 @@ void LinuxConnectionListener::handle(const epoll_event& event)
 {
     if (event.data.ptr == &socket_)
         acceptWaiting();
-    else if (event.data.ptr != &wake_) // which only wakes
+    else if (event.data.ptr != &wake_) // `wake_` itself needs no handling
         handle(*static_cast<LinuxConnection*>(event.data.ptr), event.events);
 }
 
@@ -156,7 +156,7 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     ucred peer = {};
     socklen_t size = sizeof peer;
     if (::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0)
-        return; // gone already
+        return; // it has gone already
     User& user = users_[peer.uid];
     if (user.connections == mostConnectionsOfAUser_) {
         ++hub_->counters.refused;
@@ -172,7 +172,7 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     ++hub_->counters.accepted;
     if (!delegate_->shouldAcceptNewConnection(*this, connection))
         connection->invalidate();
-    handle(*connection, 0); // in case that it is over already
+    handle(*connection, 0); // it may be over already
 }
 
 void LinuxConnectionListener::forget(const LinuxConnection& connection)
@@ -184,8 +184,7 @@ void LinuxConnectionListener::forget(const LinuxConnection& connection)
     connections_.erase(&connection);
 }
 
-// Without descriptors there is nothing to do about the clients that wait but to let them wait: asking again at
-// once would keep the thread busy for nothing.
+// Without descriptors the waiting clients must wait: trying again without a pause would only keep the thread busy.
 void LinuxConnectionListener::pauseAccepting(std::optional<Clock::duration> pause, int error)
 {
     isAccepting_ = !watch(EPOLL_CTL_MOD, socket_.descriptor(), 0, &socket_);

@@ -1,16 +1,16 @@
 // The room of connections: the socket of the service, its clients' connections, and the frames that they exchange. It
-// touches sockets and epoll. It hands calls to a queue and the descriptors for trace events to clients that ask; it
-// knows neither what a call means nor what becomes of it.
+// uses sockets and epoll. It hands calls to a queue, and a page of trace markers to clients that ask. It does not know
+// what a call means or what the service does with it.
 //
-// Accepts the connections of the socket under which the service is reached, and is the connection thread of all
-// of them: the thread that resumes the listener waits for all sockets at once and wakes for nothing else.
+// The listener accepts the connections of the service's socket. The thread that resumes it is the connection thread of
+// all of them: it waits for all sockets together, and wakes for nothing else.
 //
-// It waits with epoll itself rather than through Asio, whose waiting costs one more system call a read: of an
-// exchange that takes 3.5 us over a bare socket and 3.5 us with epoll, Asio makes 4.1 us. It also lets every
-// thread change what a socket is watched for, without waking this one.
+// It uses epoll itself rather than Asio, which makes one more system call for each read: an exchange takes 3.5 us over
+// a bare socket, 3.5 us with epoll, and 4.1 us with Asio. Epoll also lets any thread change what a socket is watched
+// for, without waking this thread.
 //
-// Having read what has come in, the thread helps with the work that came of it (SerialQueue). While it does it
-// reads nothing, and who is not read from waits; they would wait for the same work anyway.
+// When the thread has read what came in, it helps with the resulting work (see SerialQueue). It reads nothing
+// meanwhile, so clients wait; they would wait for the same work anyway.
 #pragma once
 
 #include "platform/linux/connection/ConnectionHub.h"
@@ -31,22 +31,22 @@ namespace platform {
 
 class LinuxConnectionListener final : public ConnectionListener {
 public:
-    // Of the descriptors that the process may have open, those that clients cannot take.
+    // How many of the process's descriptors clients cannot take.
     static constexpr std::size_t descriptorsForTheRest = 64;
-    // Of the connections that are left, the part (a fourth) that no user alone can take: further connections of one
-    // user are closed at once, so that none keeps the others out.
+    // The part (a fourth) of all other descriptors that one user alone cannot take. Further connections of a user are
+    // closed immediately, so that no user keeps the others out.
     static constexpr std::size_t partForOthers = 4;
-    // How long clients wait when the system has no descriptor for them.
+    // How long clients wait if the system has no descriptor for them.
     static constexpr std::chrono::milliseconds acceptingPause{1000};
 
-    // The category gets a line for every connection that breaks. Fails when the system has no descriptors left.
+    // The category gets a line for every connection that breaks. Fails if the system has no descriptors left.
     [[nodiscard]] static std::expected<std::unique_ptr<LinuxConnectionListener>, std::error_code>
     create(ListeningSocket socket, LogCategory& log);
 
     void setDelegate(ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
-    // Who hands out the marker of the kernel's trace to clients that ask. Before `resume`.
+    // Gives the trace marker to clients that ask. Call this before `resume`.
     void setEmitterAccess(EmitterAccess& access) { hub_->emitterAccess = &access; }
-    // Called by `resume` when clients that connect from now on are served. Before `resume`.
+    // `resume` calls the handler once, as soon as new clients are served. Call this before `resume`.
     void setListeningHandler(std::move_only_function<void()> handler) { listeningHandler_ = std::move(handler); }
     void resume() override;
     // Makes `resume` end all connections and return. Any thread.
@@ -61,7 +61,7 @@ private:
     // A user with connections.
     struct User {
         std::size_t connections = 0;
-        bool refusalIsLogged = false; // since one of them ended
+        bool refusalIsLogged = false; // since one of the connections ended
     };
 
     LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake, LogCategory& log);
@@ -87,7 +87,7 @@ private:
     std::move_only_function<void()> listeningHandler_;
     std::atomic<bool> isStopping_ = false;
 
-    // The connection thread's.
+    // Only for the connection thread.
     std::unordered_map<const LinuxConnection*, std::shared_ptr<LinuxConnection>> connections_;
     std::unordered_map<std::uint32_t, User> users_; // by number
     bool isAccepting_ = false;

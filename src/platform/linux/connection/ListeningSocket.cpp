@@ -1,5 +1,5 @@
-// A socket file that is in the way is removed only if nobody answers behind it: a service that was killed leaves
-// one, and one that runs must not lose its own.
+// A killed service leaves its socket file behind. Such a file is removed only if no process listens behind it, because
+// a running service must not lose its socket.
 #include "platform/linux/connection/ListeningSocket.h"
 
 #include "platform/linux/files/SystemError.h"
@@ -37,7 +37,7 @@ bool bindTo(const FileDescriptor& socket, const sockaddr_un& address)
     return ::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0;
 }
 
-// Whether the file is a socket that nobody holds any more. A full backlog refuses too, but with EAGAIN.
+// Whether the file is a socket that no process holds. A full backlog refuses as well, but with EAGAIN.
 std::expected<void, Failure> checkIsStale(const sockaddr_un& address)
 {
     struct stat status = {};
@@ -102,7 +102,7 @@ ListeningSocket::Result ListeningSocket::bind(std::filesystem::path path, unsign
             return failWithSystemError();
     }
     ListeningSocket socket(std::move(descriptor), std::move(path));
-    // In this order: until it listens, nobody can use permissions that the umask left too wide.
+    // In this order: before it listens, no client can use permissions that the umask left too wide.
     if (::chmod(address.sun_path, permissions) != 0 || ::listen(socket.descriptor(), SOMAXCONN) != 0)
         return failWithSystemError();
     return socket;

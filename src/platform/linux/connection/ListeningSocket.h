@@ -1,5 +1,4 @@
-// The socket on which the service is reached: one that the service manager opened and passed on, or one bound
-// at a path.
+// The socket of the service: either one that the service manager opened and passed, or one bound at a path.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -19,7 +18,7 @@ enum class ListeningSocketError : std::uint8_t {
     SystemError // the system refused, for the reason given beside
 };
 
-// What went wrong, and `errno` where the system said why.
+// What went wrong, with `errno` if the system gave the reason.
 struct ListeningSocketFailure {
     ListeningSocketError error;
     int systemError = 0;
@@ -28,21 +27,21 @@ struct ListeningSocketFailure {
 // The failure as words for a log line, such as "another process listens there".
 [[nodiscard]] std::string description(const ListeningSocketFailure& failure);
 
-// A socket that is ready to be accepted from. The file of one that was bound here goes with it.
+// A socket that is ready to accept clients. If it was bound here, its destructor removes its file.
 class ListeningSocket {
 public:
     using Result = std::expected<ListeningSocket, ListeningSocketFailure>;
 
-    // Who may connect, as permissions of the socket's file. Clients belong to any user, and every one of them is
-    // treated as hostile: by default all may.
+    // Who may connect, as permissions of the socket's file. By default every user may: each client is treated as
+    // hostile.
     static constexpr unsigned everyone = 0666;
 
-    // The socket that the service manager passed (LISTEN_FDS), or nothing when it passed none. To be asked once;
-    // the variables are then gone from the environment.
+    // The socket that the service manager passed (LISTEN_FDS), or nothing if it passed none. Call it only once: it
+    // removes the variables from the environment.
     [[nodiscard]] static std::expected<std::optional<ListeningSocket>, ListeningSocketFailure> passed();
 
-    // Binds at the path. The file that a process left behind when it died is replaced; one behind which
-    // somebody listens, or that is no socket, is left alone.
+    // Binds at the path. Replaces the socket file of a process that died. Leaves a file alone that is not a socket, or
+    // behind which a process listens.
     [[nodiscard]] static Result bind(std::filesystem::path path, unsigned permissions = everyone);
 
     ListeningSocket(ListeningSocket&&) noexcept = default;

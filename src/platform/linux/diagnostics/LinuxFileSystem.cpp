@@ -1,4 +1,4 @@
-// A path is walked one folder at a time, each by its descriptor, so that the checked folder is the one that is used.
+// A path is walked one folder at a time, each by its descriptor, so that the service uses the folder that it checked.
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 
 #include "foundation/text/Format.h"
@@ -70,7 +70,7 @@ std::error_code makeIfMissing(int parent, const char* name, unsigned permissions
 {
     if (::mkdirat(parent, name, permissions) != 0)
         return errno == EEXIST ? std::error_code() : systemError();
-    // The umask took its part, and is the process's and not to be touched.
+    // mkdir applied the umask, which belongs to the whole process and must not change.
     return ::fchmodat(parent, name, permissions, AT_SYMLINK_NOFOLLOW) == 0 ? std::error_code() : systemError();
 }
 
@@ -150,7 +150,7 @@ LinuxFileSystem::createAtomically(const std::filesystem::path& path)
     std::string name = temporaryName();
     FileDescriptor file(
         ::openat(directory->get(), name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByAll));
-    if (!file || ::fchmod(file.get(), readableByAll) != 0) // the umask took its part, as it does of folders
+    if (!file || ::fchmod(file.get(), readableByAll) != 0) // open applied the umask, as mkdir does
         return std::unexpected(systemError());
     return std::make_unique<LinuxAtomicFile>(*std::move(directory), std::move(file), std::move(name),
                                              path.filename().string());
@@ -173,7 +173,7 @@ std::expected<std::string, std::error_code> LinuxFileSystem::readFile(const std:
                                                                       std::size_t limit)
 {
     const std::unexpected notAFile(std::make_error_code(std::errc::invalid_argument));
-    if (path.native().contains('\0')) // the system would take the part before it for the path
+    if (path.native().contains('\0')) // the system would take the part before it as the path
         return notAFile;
     const FileDescriptor place(::open(path.c_str(), O_PATH | O_CLOEXEC));
     struct stat status = {};

@@ -1,4 +1,4 @@
-// Writing to a descriptor that may take less than it is given.
+// Writing to a descriptor that may accept fewer bytes than it gets.
 #pragma once
 
 #include <cerrno>

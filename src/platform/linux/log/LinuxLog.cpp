@@ -148,7 +148,7 @@ void LinuxLog::reportLost()
 
 void LinuxLog::writeToDescriptor(std::string_view line) const
 {
-    static_cast<void>(writeAll(descriptor_, line)); // there is nowhere left to say that it failed
+    static_cast<void>(writeAll(descriptor_, line)); // a failure here cannot be reported anywhere
 }
 
 } // namespace platform

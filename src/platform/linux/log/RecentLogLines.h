@@ -1,4 +1,4 @@
-// The last lines of the log, kept in memory: they are half of the evidence of a bug, and the service may not be allowed
+// The last lines of the log, kept in memory: they are half of the evidence of a bug, and the service may lack the right
 // to read the journal.
 #pragma once
 

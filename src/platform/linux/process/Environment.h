@@ -6,8 +6,8 @@
 
 namespace platform {
 
-// Empty when the variable is not set, or when the program runs with privileges that the user who set it does not have.
-// Not while another thread changes the environment.
+// Empty if the variable is not set, or if the program runs with more privileges than the user that set it. Must not be
+// called while another thread changes the environment.
 [[nodiscard]] inline std::string environment(const char* variable)
 {
     const char* value = ::secure_getenv(variable);

@@ -23,7 +23,7 @@ std::optional<std::string> readName(std::string_view process)
         return std::nullopt;
     if (name->ends_with('\n'))
         name->pop_back();
-    // A process names itself, in any bytes; the kernel cuts the name, be it inside a character.
+    // A process names itself, in any bytes; the kernel cuts the name, even inside a character.
     foundation::replaceWhatIsNotUtf8(*name);
     return std::move(*name);
 }

@@ -45,7 +45,7 @@ std::thread startThread(std::string_view name, QualityOfService quality, WorkIte
 {
     return std::thread([name = threadName(name), quality, body = std::move(body)]() mutable {
         setQualityOfThisThread(quality);
-        pthread_setname_np(pthread_self(), name.c_str()); // last: who sees the name sees the priority
+        pthread_setname_np(pthread_self(), name.c_str()); // last: a thread with its name has its priority
         body();
     });
 }

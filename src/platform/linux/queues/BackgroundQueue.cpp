@@ -1,5 +1,4 @@
-// One list for all threads; a thread is added only when more items wait than threads are free to take them, and
-// stays.
+// One list for all threads. A thread is added only if more items wait than threads are free; it then stays.
 #include "platform/linux/queues/BackgroundQueue.h"
 
 #include "platform/linux/process/Thread.h"
@@ -25,7 +24,7 @@ BackgroundQueue::~BackgroundQueue()
     }
     for (std::thread& thread : threads)
         thread.join();
-    run(); // what there never was a thread for
+    run(); // items that never got a thread
     queueOfThisThread = nullptr;
 }
 
@@ -60,7 +59,7 @@ void BackgroundQueue::run()
         item();
 }
 
-// The next item; an empty one when there will be none.
+// The next item, or an empty one at the end.
 WorkItem BackgroundQueue::take()
 {
     const foundation::Lock lock(lock_);

@@ -1,10 +1,9 @@
-// The concurrent queue of background priority: a few threads, each started when there is work for it and no
-// other is free.
+// The concurrent queue of background priority: a few threads. Each is started when an item waits and no other thread is
+// free.
 //
-// They are few on purpose, as background work must never crowd out the rest. An item that waits for
-// another item of the queue may therefore wait for ever. When the system has no thread to spare, items wait for those
-// that there are, or for one that it has when the next item comes: who submits is in the middle of something else, and
-// could do nothing about it.
+// The threads are few on purpose: background work must never crowd out the rest. So an item that waits for another item
+// of the queue may wait for ever. If the system has no thread to spare, items wait for the existing threads, or for a
+// thread that the next item gets. `submit` does not report this, because its callers could do nothing about it.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -22,7 +21,7 @@ public:
     static constexpr std::size_t mostThreads = 4;
 
     BackgroundQueue() = default;
-    // Waits until everything submitted has been run. Not from one of its own items.
+    // Waits until all submitted items have run. An item of the queue must not call it.
     ~BackgroundQueue() override;
     BackgroundQueue(const BackgroundQueue&) = delete;
     BackgroundQueue& operator=(const BackgroundQueue&) = delete;

@@ -1,4 +1,5 @@
-// A schedule ordered by time; the thread wakes for its beginning only, and is woken only by what comes before that.
+// The schedule is ordered by time. The thread sleeps until its first item is due; only an earlier item wakes the
+// thread.
 #include "platform/linux/queues/DelayedWork.h"
 
 #include "platform/linux/process/Thread.h"
@@ -26,7 +27,7 @@ void DelayedWork::add(Clock::time_point due, WorkQueue& queue, WorkItem item)
     const foundation::Lock lock(lock_);
     const auto added = schedule_.emplace(due, Delayed{queue, std::move(item)});
     if (!thread_.joinable())
-        static_cast<void>(start()); // if there is no thread to spare, the next item tries again
+        static_cast<void>(start()); // if the system refuses a thread, the next item tries again
     else if (added == schedule_.begin())
         changed_.notifyOne();
 }
@@ -47,7 +48,7 @@ void DelayedWork::run()
         due.mapped().queue.submit(std::move(due.mapped().item));
 }
 
-// Takes the next item when its time has come; an empty one when the work ends.
+// Waits for the next item that is due; empty at the end.
 DelayedWork::Schedule::node_type DelayedWork::waitForDue()
 {
     const foundation::Lock lock(lock_);

@@ -1,5 +1,5 @@
-// Work that starts later: a thread, started on first use, that sleeps until the next item is due and then
-// gives it to the queue on which it is to run.
+// Work that starts later. The first item starts a thread, which sleeps until the next item is due and then submits it
+// to its queue.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -17,13 +17,13 @@ public:
     using Clock = std::chrono::steady_clock;
 
     DelayedWork() = default;
-    // What is not due yet is dropped.
+    // Drops the items that are not due yet.
     ~DelayedWork();
     DelayedWork(const DelayedWork&) = delete;
     DelayedWork& operator=(const DelayedWork&) = delete;
 
-    // Submits the item to the queue, which still exists then, at that time or soon after; when the system has no thread
-    // to spare, not before it has one for an item that is added later.
+    // Submits the item to the queue at that time or soon after. The queue must still exist then. If the system has no
+    // thread to spare, the item waits at least until a later item gets one.
     void add(Clock::time_point due, WorkQueue& queue, WorkItem item);
 
 private:

@@ -1,4 +1,4 @@
-// The one who makes it much sees to the rest: there is nothing to lock.
+// The thread that reaches the limit submits the work, so that there is nothing to lock.
 #include "platform/linux/queues/LinuxMemory.h"
 
 #include "platform/linux/queues/ThreadHeap.h"

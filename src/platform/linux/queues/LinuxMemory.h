@@ -1,9 +1,9 @@
-// Memory that was let go returns to the system some seconds later.
+// Freed memory returns to the system some seconds later.
 //
-// An allocator keeps what it is given back for the next request, and hands it on to the system in the course of later
-// requests only: a service that falls idle after a long session would keep that session's memory for ever. It returns
-// seconds later, and not at once, for two reasons: the next session would pay for the first touch of every page again,
-// and the threads that write what a session left are not done with it yet.
+// An allocator keeps freed memory for the next request, and returns it to the system only in the course of later
+// requests: a service that falls idle after a long session would keep that session's memory for ever. It returns after
+// some seconds, not immediately, for two reasons: the next session would pay again for the first touch of every page,
+// and the threads that write what a session left still use it.
 #pragma once
 
 #include "platform/Memory.h"
@@ -17,9 +17,9 @@ namespace platform {
 // Any thread. It outlives the work that the queues delay.
 class LinuxMemory final : public Memory {
 public:
-    // Less than that is not worth waking threads for.
+    // Fewer bytes are not worth waking threads for.
     static constexpr std::size_t much = std::size_t{4} << 20;
-    // From the moment at which so much has been let go since the threads last tidied their heaps.
+    // Counts from the moment at which so many bytes are free since the threads last tidied their heaps.
     static constexpr std::chrono::seconds delay{5};
 
     explicit LinuxMemory(WorkQueues& queues) : queues_(queues) { }

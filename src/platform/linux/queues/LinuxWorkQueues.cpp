@@ -1,4 +1,4 @@
-// Only turn queues have turns that end in something: the items of others get no turn to gather anything in.
+// Only the turns of turn queues have an end handler: items of other queues get no turn in which to gather.
 #include "platform/linux/queues/LinuxWorkQueues.h"
 
 #include "foundation/Mutex.h"

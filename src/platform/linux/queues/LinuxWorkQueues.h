@@ -1,7 +1,7 @@
-// The room of queues: who runs what, in which order, on which thread. It touches threads, their heaps and clocks, and
-// knows nothing of what it runs.
+// The room of queues: which thread runs which items, and in which order. It uses threads, their heaps and clocks, and
+// does not know what the items do.
 //
-// The work queues of the process, on threads of their own.
+// The work queues of the process have threads of their own.
 #pragma once
 
 #include "platform/linux/queues/BackgroundQueue.h"
@@ -13,8 +13,8 @@ namespace platform {
 // Any thread. A serial queue lives as long as its owner keeps it, even longer than this.
 class LinuxWorkQueues final : public WorkQueues {
 public:
-    // Takes what each turn of a turn queue has gathered, on the thread that ran the turn. Set before such a queue is
-    // made.
+    // The handler takes what each turn of a turn queue has gathered, on the thread that ran the turn. Set it before the
+    // first turn queue is made.
     void setTurnEndHandler(SerialQueue::TurnEndHandler handler) { turnEndHandler_ = std::move(handler); }
 
     [[nodiscard]] std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name,
@@ -27,7 +27,7 @@ public:
 private:
     SerialQueue::TurnEndHandler turnEndHandler_;
     BackgroundQueue backgroundQueue_;
-    DelayedWork delayedWork_; // ends first, for it feeds the other
+    DelayedWork delayedWork_; // ends first, because it submits to the other
 };
 
 } // namespace platform

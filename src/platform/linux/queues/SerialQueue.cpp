@@ -1,5 +1,5 @@
-// Who runs a turn takes it, and gives it back: queue's thread and helpers alike. All that they agree on is in three
-// flags under one lock.
+// The queue's thread and helpers alike take a turn, run it, and give it back. Three flags under one lock coordinate
+// them.
 #include "platform/linux/queues/SerialQueue.h"
 
 #include "foundation/Mutex.h"
@@ -32,11 +32,11 @@ public:
         const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith;
         if (isAsleep_ && !isTurnTaken_ && !isLeftToHelper) {
             isAsleep_ = false;
-            changed_.notifyOne(); // under the lock: once it is released, the item may do away with the queue
+            changed_.notifyOne(); // under the lock: after it, the item may destroy the queue
         }
     }
 
-    // Nothing is added any more, except by items.
+    // From now on only items add items.
     void end()
     {
         const foundation::Lock lock(lock_);
@@ -55,7 +55,7 @@ public:
         }
     }
 
-    // Runs one turn on another thread, unless the queue's thread sees to it.
+    // Runs one turn on the calling thread, unless the queue's thread does or the turn is too long.
     void help()
     {
         {
@@ -69,7 +69,7 @@ public:
 
     [[nodiscard]] bool isCurrent() const noexcept { return thisThread.runs == this; }
 
-    // What a thread has to do with serial queues.
+    // The calling thread's part in serial queues.
     struct ThisThread {
         const Work* runs = nullptr;
         bool isHelper = false;
@@ -83,7 +83,7 @@ public:
     static thread_local ThisThread thisThread;
 
 private:
-    static constexpr std::size_t mostRoomKept = 1024; // in items; what a burst needed beyond that is given back
+    static constexpr std::size_t mostRoomKept = 1024; // in items; further room of a burst is freed
 
     // What the queue's thread does next.
     enum class Next : std::uint8_t { Turn, Heap, End };
@@ -145,10 +145,10 @@ private:
     foundation::Mutex lock_;
     foundation::Condition changed_;
     std::vector<TurnItem> waiting_ KESTO_GUARDED_BY(lock_);
-    std::vector<TurnItem> items_; // this and `turn_`: of the thread that has taken the turn
+    std::vector<TurnItem> items_; // `items_` and `turn_` belong to the thread that has taken the turn
     Turn turn_;
-    bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // somebody runs one
-    bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread, and nobody has woken it yet
+    bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // a thread is running one
+    bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread sleeps, and has not been woken yet
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
 };
 

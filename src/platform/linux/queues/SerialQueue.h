@@ -1,15 +1,15 @@
-// A serial work queue: a thread that sleeps while there is nothing to do, and otherwise takes all that has
-// gathered under one lock. What it takes at once is a turn.
+// A serial work queue: a thread that sleeps while no item waits, and otherwise takes all waiting items under one lock.
+// The items taken together are a turn.
 //
-// The end of a turn is the moment to do once what would be dear to do for every item, such as committing to
-// the disk and writing to sockets. The queue makes the Turn that gathers such things, gives it to every item, and hands
-// it to its turn-end handler.
+// At the end of a turn, work that is expensive for each item is done once for all, such as committing to the disk and
+// writing to sockets. The queue makes the Turn that gathers this work, gives it to every item, and hands it to the
+// turn-end handler.
 //
-// Waking a sleeping thread costs many times what an item does, and what one processor made another is slow to
-// take apart. So a thread that submits work and has nothing else to do then may offer its help: it runs the
-// turn of a queue that may be helped itself. Measured with a client that waits for each answer: 6 us a call instead
-// of 8; with one that does not wait: 515,000 calls a second instead of 280,000 to 450,000. A burst goes to the
-// queue's thread, and both threads work side by side. Either way one turn runs at a time.
+// Waking a sleeping thread costs many times what an item does, and one processor is slow to read what another made. So
+// a thread that submits work and has nothing else to do may offer its help: if the queue may be helped, that thread
+// runs the turn itself. With a client that waits for each answer, a call then takes 6 us instead of 8; one that does
+// not wait makes 515,000 calls a second instead of 280,000 to 450,000. A burst still goes to the queue's thread, so
+// that both threads work side by side. Only one turn runs at a time.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -26,14 +26,14 @@ class SerialQueue final : public TurnQueue {
 public:
     using TurnEndHandler = std::function<void(Turn& turn)>;
 
-    // Turns of up to so many items are run by a thread that helps: some milliseconds of its time.
+    // A helper runs only turns of at most so many items, which take some milliseconds.
     static constexpr std::size_t mostItemsHelpedWith = 1024;
 
-    // The handler takes what a turn gathered. It is called after every turn, when the turn's items and all that they
-    // held are gone, on the thread that ran them. It may be empty where no item gathers anything.
+    // The handler takes what a turn gathered. It is called after every turn, on the thread that ran it, when the items
+    // and everything that they held are destroyed. It may be empty if no item gathers anything.
     SerialQueue(std::string_view name, SerialQueueOptions options, TurnEndHandler turnEndHandler = nullptr);
-    // Waits until everything submitted has been run. The queue may go while one of its own items runs: its
-    // thread then ends by itself afterwards.
+    // Waits until all submitted items have run. If one of the queue's own items destroys the queue, this does not wait,
+    // and the thread ends later.
     ~SerialQueue() override;
     SerialQueue(const SerialQueue&) = delete;
     SerialQueue& operator=(const SerialQueue&) = delete;
@@ -42,8 +42,9 @@ public:
     void submit(TurnItem item) override;
     [[nodiscard]] bool isCurrent() const override;
 
-    // The calling thread helps as long as this lives, with the priority of an interactive queue: without it, a client
-    // that is woken by its answer takes the processor from whoever has not yet finished with it. One a thread.
+    // The calling thread helps as long as this object lives. Its priority is that of an interactive queue: with a lower
+    // one, a client that wakes for an answer would displace the thread that is not yet done with it. One for each
+    // thread.
     class Helper {
     public:
         Helper();
@@ -51,15 +52,15 @@ public:
         Helper(const Helper&) = delete;
         Helper& operator=(const Helper&) = delete;
 
-        // Runs the turn that this thread has submitted since the last time, if there is one and nobody else
-        // runs it. To be called when the thread would otherwise sleep.
+        // Runs the turn with the items that this thread has submitted since the last call, unless another thread runs
+        // it. Call it when the thread would otherwise sleep.
         void help();
     };
 
 private:
     class Work;
 
-    std::shared_ptr<Work> work_; // the thread has it too, for it may outlive the queue
+    std::shared_ptr<Work> work_; // shared with the thread, which may outlive the queue
     std::thread thread_;
 };
 

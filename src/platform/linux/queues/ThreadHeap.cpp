@@ -1,4 +1,4 @@
-// A list of the heaps there are, and what the service's allocator has to be told so that it gives back all that it can.
+// The list of all heaps, and how the service's allocator returns all the memory that it can.
 #include "platform/linux/queues/ThreadHeap.h"
 
 #include "foundation/Mutex.h"
@@ -22,21 +22,22 @@ struct Heaps {
     std::vector<ThreadHeap*> all KESTO_GUARDED_BY(lock);
 };
 
-// For ever: threads may outlive what is static.
+// Never destroyed: threads may outlive static objects.
 Heaps& heaps()
 {
     static auto& heaps = *new Heaps;
     return heaps;
 }
 
-// mimalloc takes memory from the system in segments of 32 MiB and divides them into pages. `mi_collect` returns the
-// segments in which nothing is left. Of the others, it returns only the pages that it frees itself, and those at once
-// only if there is no delay; pages that were freed before wait for the next page to be taken from their segment. So a
-// few pages are taken and freed, which touches next to nothing. Without that, 35 MB stay after three sessions of
+// mimalloc takes memory from the system in segments of 32 MiB and divides them into pages. `mi_collect` returns empty
+// segments. From other segments it returns only the pages that it frees itself, and immediately only if the delay is 0.
+// Pages that were freed earlier return when the next page is taken from their segment. So this function takes and frees
+// a few pages, which costs next to nothing. Without it, 35 MB stay after three sessions of 200,000 volume changes each;
+// with it, 1 MB.
 // 200,000 volume changes each; with it, 1 MB.
 void tidyHeapOfThisThread()
 {
-    static foundation::Mutex delayLock; // the delay is that of all threads
+    static foundation::Mutex delayLock; // all threads share the delay
     constexpr std::size_t bytesOfAPage = std::size_t{1} << 20;
     constexpr std::size_t pages = 64;
     if (mi_collect == nullptr)

@@ -1,7 +1,8 @@
 // The heap of a thread that works for clients.
 //
-// Each thread has a heap of its own, which no other thread can tidy. What one thread allocated, another may have freed,
-// so neither knows by itself that its heap could do with it: all are asked, and those that sleep are woken.
+// Each thread has its own heap, which no other thread can tidy. Memory that one thread allocated may be freed by
+// another, so no thread knows whether its heap holds much free memory: every thread tidies its heap when asked, and a
+// sleeping thread is woken for it.
 #pragma once
 
 #include <atomic>
@@ -9,10 +10,11 @@
 
 namespace platform {
 
-// Its thread makes it, uses it and ends it.
+// Only its own thread makes, uses and destroys it.
 class ThreadHeap {
 public:
-    // `wake` makes the thread call `tidyIfAsked` soon, though it sleep. Any thread calls it, while this lives.
+    // `wake` makes the thread call `tidyIfAsked` soon, even if it sleeps. Any thread may call `wake` while this object
+    // exists.
     explicit ThreadHeap(std::function<void()> wake);
     ~ThreadHeap();
     ThreadHeap(const ThreadHeap&) = delete;
@@ -20,10 +22,10 @@ public:
 
     // Any thread.
     [[nodiscard]] bool isAsked() const noexcept { return isAsked_; }
-    // Gives the system what the heap does not need, once each time that it was asked to. Whether it was.
+    // Returns the heap's free memory to the system, once for each request. Whether there was a request.
     bool tidyIfAsked();
 
-    // Asks every thread that has such a heap. Any thread.
+    // Asks all threads with such a heap. Any thread.
     static void askAll();
 
 private:

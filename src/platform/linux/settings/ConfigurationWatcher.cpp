@@ -1,5 +1,5 @@
 // inotify watches only existing directories. So the watcher awaits a missing directory by its name in the nearest
-// directory above it, and checks all directories anew each time that such a name comes or goes.
+// directory above it, and checks all directories again each time that such a name comes or goes.
 #include "platform/linux/settings/ConfigurationWatcher.h"
 
 #include "platform/linux/process/Thread.h"
@@ -75,9 +75,9 @@ bool ConfigurationWatcher::start()
     return thread_.joinable();
 }
 
-// Sets up all watches anew: there are few directories, so single changes need no treatment of their own. An unchanged
+// Sets up all watches again: there are few directories, so single changes need no treatment of their own. An unchanged
 // directory is watched without a gap, because the kernel recognises it and returns the same descriptor. Returns the
-// directories whose files were not watched before.
+// directories with files that were not watched before.
 std::set<fs::path> ConfigurationWatcher::arm()
 {
     const auto before = std::exchange(places_, {});

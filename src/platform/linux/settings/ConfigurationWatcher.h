@@ -37,7 +37,7 @@ public:
         Writes // a file was written and closed, put in place or touched, even with the same content
     };
 
-    // A watch ends with this object, whose destructor waits for a running handler.
+    // A watch ends with this object; its destructor waits for a running handler.
     class Watch {
     public:
         ~Watch();

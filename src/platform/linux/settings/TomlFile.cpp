@@ -1,4 +1,4 @@
-// The only file that includes toml++, which is large and slow to compile, and whose wrong assertions need a workaround.
+// The only file that includes toml++: it is large and slow to compile, and its wrong assertions need a workaround.
 #include "platform/linux/settings/TomlFile.h"
 
 #include "platform/linux/files/SmallFile.h"

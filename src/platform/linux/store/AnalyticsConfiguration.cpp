@@ -1,5 +1,4 @@
-// Every key is read by itself, so that one wrong value costs its owner that one setting and a line which says what
-// belongs there.
+// Every key is read separately: a wrong value affects only its own setting, and a line says which value belongs there.
 #include "platform/linux/store/AnalyticsConfiguration.h"
 
 #include <algorithm>
@@ -34,7 +33,7 @@ std::optional<double> positiveNumberOf(const Value& value)
     return isNumber && number->doubleValue() > 0 ? std::optional(number->doubleValue()) : std::nullopt;
 }
 
-// Puts a value in its place, or returns what should stand there instead.
+// Stores the value, or returns what should stand there instead.
 std::string_view read(std::string_view key, const Value& value, AnalyticsConfiguration& configuration)
 {
     if (key == "used") {

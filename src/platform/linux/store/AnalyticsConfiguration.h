@@ -1,5 +1,5 @@
-// What the owner of the device decides about analytics events, in analytics.toml: which are wanted, how long and
-// how many of them are kept, and how much a power failure may cost.
+// The device owner's settings for analytics events, in analytics.toml: which events the service keeps, for how long and
+// how many, and how much a power failure may cost.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -13,7 +13,7 @@ namespace platform {
 
 enum class StoreSynchronization : std::uint8_t {
     Normal, // a power failure may take the last moments, never the database
-    Full // what was acknowledged outlasts a power failure too; every commit waits for the disk
+    Full // acknowledged events survive a power failure too; every commit waits for the disk
 };
 
 struct AnalyticsConfiguration {
@@ -25,8 +25,8 @@ struct AnalyticsConfiguration {
     friend bool operator==(const AnalyticsConfiguration&, const AnalyticsConfiguration&) = default;
 };
 
-// A configuration, and what was wrong with the values: one line each, for a person. What is wrong or not there
-// has its default.
+// A configuration, and what was wrong with the values: one line each, for a person. Missing and wrong values have their
+// defaults.
 struct CheckedAnalyticsConfiguration {
     AnalyticsConfiguration configuration;
     std::vector<std::string> problems;
@@ -35,8 +35,8 @@ struct CheckedAnalyticsConfiguration {
 // Any thread.
 [[nodiscard]] CheckedAnalyticsConfiguration readAnalyticsConfiguration(const foundation::Dictionary& values);
 
-// Whether the name matches one of the globs: "*" is any text, "?" any character, "[a-z]" and "[^a-z]" one of a
-// set, as in SQL's GLOB, so that a pattern means the same here and in a query. Any thread.
+// Whether the name matches one of the globs. "*" is any text, "?" any character, "[a-z]" and "[^a-z]" one character of
+// a set: as in SQL's GLOB, so that a pattern means the same here and in a query. Any thread.
 [[nodiscard]] bool matchesAny(const std::vector<std::string>& globs, const std::string& name);
 
 } // namespace platform

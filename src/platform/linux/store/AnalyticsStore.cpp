@@ -1,4 +1,4 @@
-// Batches of events between those who send them and the thread that writes them.
+// Batches of events between the threads that send them and the thread that writes them.
 #include "platform/linux/store/AnalyticsStore.h"
 
 #include "platform/linux/process/Thread.h"
@@ -9,7 +9,7 @@
 namespace platform {
 
 namespace {
-constexpr std::size_t mostRoomKept = 1024; // in turns that wait; what a burst needed beyond that is given back
+constexpr std::size_t mostRoomKept = 1024; // in waiting turns; further room of a burst is freed
 }
 
 // --- Batches
@@ -27,7 +27,7 @@ bool AnalyticsStore::isRoomBeside(const EventBatch& events, std::size_t waiters)
     return events.size() + waiters < limits_.mostEvents && events.bytes() < limits_.mostBytes;
 }
 
-// --- What others call
+// --- For callers
 
 AnalyticsStore::AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
                                ProviderLog log, Limits limits)
@@ -53,7 +53,7 @@ AnalyticsStore::~AnalyticsStore()
 
 void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder)
 {
-    if (!isAnalyticsEventUsed(eventName)) // of those that ask before, this costs little
+    if (!isAnalyticsEventUsed(eventName)) // most callers have asked already, and then this costs little
         return;
     const double time = clock_.secondsSince1970();
     turn.events.add(time, eventName, payloadBuilder());
@@ -107,9 +107,9 @@ void AnalyticsStore::flush()
     kept.get_future().wait();
 }
 
-// --- Between them and the store's thread
+// --- Between callers and the store's thread
 
-// Reads the values anew, so that whoever comes last applies the last.
+// Reads the current values, so that of several calls the last applies the last values.
 void AnalyticsStore::applyConfiguration()
 {
     std::vector<std::string> problems;
@@ -160,7 +160,7 @@ void AnalyticsStore::run()
     }
 }
 
-// Waits for something to write, or to do, and takes all of it; false at the end.
+// Waits for events, callbacks or a new configuration, or for a quiet moment, and takes all of them. False at the end.
 bool AnalyticsStore::take(Batch& batch)
 {
     std::optional<AnalyticsConfiguration> configuration;
@@ -170,7 +170,7 @@ bool AnalyticsStore::take(Batch& batch)
             if (isEnding_)
                 return false;
             if (!sleep())
-                break; // with nothing, in a quiet moment
+                break; // takes an empty batch, because the store is quiet
         }
         std::swap(configuration, newConfiguration_);
         std::swap(batch, waiting_);
@@ -182,7 +182,7 @@ bool AnalyticsStore::take(Batch& batch)
     return true;
 }
 
-// False when it became quiet and that was waited for.
+// False if the keeper awaited a quiet moment and it came.
 bool AnalyticsStore::sleep()
 {
     bool isQuiet = false;

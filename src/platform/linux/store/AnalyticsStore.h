@@ -1,12 +1,12 @@
-// The room of the store: from an event that was sent to a row on the disk. It alone touches SQLite and the state
-// directory's database.
+// The room of the store: from a sent event to a row on the disk. No other part uses SQLite or the database in the state
+// directory.
 //
-// The analytics service: events go to an EventKeeper, which for the service is a database that anyone can query with
-// SQL.
+// The analytics service hands events to an EventKeeper. In the service the keeper is a database that every program may
+// query with SQL.
 //
 // Acknowledged means kept: `endTurn` takes what a turn gathered, and calls back when all of it is committed. The turn
-// itself never waits for the disk. A thread of the store takes what has gathered as one transaction while the next
-// turns go on, so that the busier the service, the cheaper a commit.
+// itself never waits for the disk. While the next turns run, the store's thread commits all gathered events in one
+// transaction; so a commit becomes cheaper for each event as the service gets busier.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -34,18 +34,18 @@ class AnalyticsStore final : public Analytics {
 public:
     using WhenKept = std::move_only_function<void()>;
 
-    // How much may wait to be written, while as much again is being written. More would make commits no cheaper
-    // and the payloads leave the processor's caches before they are written.
+    // How much may wait for the store's thread while it writes as much again. More would not make commits cheaper, and
+    // the payloads would leave the processor's caches before they are written.
     struct Limits {
         std::size_t mostEvents = 4096;
         std::size_t mostBytes = 4 * 1024 * 1024;
     };
 
-    // After how long without an event it is quiet.
+    // The store is quiet after this time without an event.
     static constexpr std::chrono::milliseconds quietTime{50};
 
-    // Events go to the keeper; analytics.toml in the configuration directory says which are wanted and for how long
-    // they are kept.
+    // Hands events to the keeper. analytics.toml in the configuration directory says which events the store keeps, and
+    // for how long.
     AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
                    ProviderLog log, Limits limits);
     AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
@@ -53,21 +53,23 @@ public:
         : AnalyticsStore(std::move(keeper), watcher, clock, log, Limits())
     {
     }
-    // Writes everything that was sent, but for turns that have not ended.
+    // Writes everything that was sent, except for turns that have not ended.
     ~AnalyticsStore() override;
 
     [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override { return names_.contains(eventName); }
-    // Both stamp the event with the time and build its payload at once, and block only while too much waits to be
-    // written. An event of a turn is written when the turn has ended, or is too large, any other at once.
+    // Both stamp the event with the time and build its payload before they return. They block only while too much waits
+    // to be written. An event of a turn is written when the turn has ended or is too large, any other event as soon as
+    // possible.
     void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
     void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
 
-    // Takes the events of a turn. `whenKept`, unless it is empty, is called once everything that was taken so far is
-    // committed, or counted as lost: here and now when it is, on the store's thread otherwise, one after the other in
-    // the order of the turns. It must not use the store. Blocks only while too much waits to be written.
+    // Takes the events of a turn. Calls `whenKept`, unless it is empty, once everything taken so far is committed or
+    // counted as lost: before it returns if that is so already, otherwise later on the store's thread. The calls come
+    // in the order of the turns, one at a time. `whenKept` must not use the store. Blocks only while too much waits to
+    // be written.
     void endTurn(Turn& turn, WhenKept whenKept);
 
-    // Returns when everything that was taken so far is committed, or counted as lost.
+    // Returns when everything taken so far is committed or counted as lost.
     void flush();
 
     // Since the start.
@@ -75,7 +77,7 @@ public:
     [[nodiscard]] std::uint64_t lostEvents(StoreError reason) const noexcept { return keeper_->lostEvents(reason); }
 
 private:
-    // Events, and who waits for them.
+    // Events, and the callbacks that wait for them.
     struct Batch {
         EventBatch events;
         std::vector<WhenKept> whenKept;
@@ -90,7 +92,7 @@ private:
     void wakeKeeper() KESTO_REQUIRES(lock_);
     void waitForRoom() KESTO_REQUIRES(lock_);
 
-    // The store's thread.
+    // Only for the store's thread.
     void run();
     [[nodiscard]] bool take(Batch& batch);
     [[nodiscard]] bool sleep() KESTO_REQUIRES(lock_);
@@ -101,15 +103,15 @@ private:
     const ProviderLog log_;
     const Limits limits_;
     UsedEventNames names_;
-    const std::unique_ptr<EventKeeper> keeper_; // the store's thread's
+    const std::unique_ptr<EventKeeper> keeper_; // only for the store's thread
 
     foundation::Mutex lock_;
-    foundation::Condition changed_; // something waits to be written
-    foundation::Condition room_; // what waited is being written
+    foundation::Condition changed_; // the store's thread has work
+    foundation::Condition room_; // the waiting batch was taken
     Batch waiting_ KESTO_GUARDED_BY(lock_);
     std::optional<AnalyticsConfiguration> newConfiguration_ KESTO_GUARDED_BY(lock_);
-    bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until those who wait have been told
-    bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // so that only who finds the thread asleep pays for waking it
+    bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until the callbacks of the batch have returned
+    bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // so that only a caller that finds it asleep pays for waking it
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
 
     WatchedTomlFile configurationFile_;

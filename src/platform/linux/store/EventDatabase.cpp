@@ -1,5 +1,4 @@
-// The only file that speaks to the database. SQLite's errors become the few kinds that an owner can do something
-// about.
+// The only file that uses SQLite's interface. It reduces SQLite's errors to the few kinds that an owner can act on.
 #include "platform/linux/store/EventDatabase.h"
 
 #include <cassert>
@@ -14,7 +13,7 @@
 namespace platform {
 namespace {
 
-// What stays of a log once it begins anew: as much as a burst needs.
+// The size of the log file that stays when the log is empty again: a burst needs as much.
 constexpr std::uint64_t mostLogKept = 32 * 1024 * 1024;
 
 bool isForWantOfRoom(int systemError)
@@ -22,7 +21,7 @@ bool isForWantOfRoom(int systemError)
     return systemError == ENOSPC || systemError == EDQUOT || systemError == EFBIG;
 }
 
-// SQLite knows a full disk by itself, but neither a quota nor a limit of files that is used up.
+// SQLite recognises a full disk, but not a quota or a limit of file sizes that is used up.
 StoreError errorOfDisk(sqlite3* connection)
 {
     for (const int which : {SQLITE_FCNTL_FILE_POINTER, SQLITE_FCNTL_JOURNAL_POINTER}) {
@@ -85,7 +84,7 @@ EventDatabase::Expected<std::unique_ptr<EventDatabase>> EventDatabase::open(cons
     return database;
 }
 
-// Not on the file itself: closing any descriptor of it would take SQLite's own locks away.
+// The lock is not on the file itself: closing any descriptor of the file would release SQLite's own locks.
 EventDatabase::Expected<> EventDatabase::lockDirectory()
 {
     directoryLock_ = FileDescriptor(::open(path_.parent_path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
@@ -147,15 +146,15 @@ EventDatabase::Expected<> EventDatabase::configure()
     pageSize_ = static_cast<std::uint64_t>(*pageSize);
     if (const auto done = beginLog(); !done)
         return done;
-    // The log stays when the last connection closes: without it, those who may not write to the directory could
-    // not read either.
+    // The log stays when the last connection closes: without it, users that may not write to the directory could not
+    // read the database either.
     int keepLog = 1;
     ::sqlite3_file_control(connection_.get(), "main", SQLITE_FCNTL_PERSIST_WAL, &keepLog);
     const auto noteLog = [](void* database, sqlite3*, const char*, int pages) {
         static_cast<EventDatabase*>(database)->logPages_ = static_cast<std::uint64_t>(pages);
         return SQLITE_OK;
     };
-    ::sqlite3_wal_hook(connection_.get(), noteLog, this); // in place of SQLite's own moments for checkpoints
+    ::sqlite3_wal_hook(connection_.get(), noteLog, this); // in place of SQLite's automatic checkpoints
     return execute(fmt::format("PRAGMA journal_size_limit = {}", mostLogKept).c_str());
 }
 
@@ -189,7 +188,7 @@ EventDatabase::Expected<> EventDatabase::prepareStatements()
     for (const auto& [statement, sql] : wanted) {
         auto prepared = prepare(sql);
         if (!prepared)
-            return std::unexpected(prepared.error() == StoreError::Other ? StoreError::Corrupt // another schema
+            return std::unexpected(prepared.error() == StoreError::Other ? StoreError::Corrupt // it has another schema
                                                                          : prepared.error());
         *statement = std::move(*prepared);
     }
@@ -229,14 +228,14 @@ EventDatabase::Expected<> EventDatabase::insert(std::span<const EventRow> rows)
     return {};
 }
 
-// The texts stay where they are until the statement has run.
+// The statement refers to the texts, so they must stay in place until it has run.
 void EventDatabase::bind(const Statement& statement, int firstParameter, const EventRow& row)
 {
     const auto bindText = [&statement](int parameter, std::string_view text) {
         return ::sqlite3_bind_text(statement.get(), parameter, text.data(), count(text.size()), SQLITE_STATIC)
             == SQLITE_OK;
     };
-    [[maybe_unused]] const bool areBound = // nothing is copied, and no event comes near the length that SQLite takes
+    [[maybe_unused]] const bool areBound = // no copy; every event is far shorter than SQLite's limit
         ::sqlite3_bind_double(statement.get(), firstParameter, row.time) == SQLITE_OK
         && bindText(firstParameter + 1, row.name) && bindText(firstParameter + 2, row.payload);
     assert(areBound);
@@ -253,7 +252,7 @@ void EventDatabase::rollBack()
         ::sqlite3_exec(connection_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
 }
 
-// --- Staying within bounds
+// --- Limits
 
 bool EventDatabase::emptyLog(std::chrono::milliseconds wait)
 {

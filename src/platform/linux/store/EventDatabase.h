@@ -1,9 +1,9 @@
-// The SQLite file of the analytics store: writing to it, and keeping it within its bounds.
+// The SQLite file of the analytics store: it writes events and keeps the file within its limits.
 //
-// Exactly one connection writes and checkpoints, and it is this one: SQLite 3.40 can damage a database when two
-// connections do so at once. A lock on the directory keeps a second service away; everybody else opens the file
-// read-only. The log is written ahead (WAL), so that readers and the writer do not hold each other up and what
-// was committed outlives the process.
+// Only this connection writes and checkpoints, because SQLite 3.40 can damage a database when two connections do so at
+// the same time. A lock on the directory keeps a second service away; all other programs open the file read-only. The
+// log is written ahead (WAL): readers and the writer do not delay each other, and committed events survive the end of
+// the process.
 #pragma once
 
 #include "platform/EventBatch.h"
@@ -30,45 +30,46 @@ public:
     template <typename Result = void> using Expected = std::expected<Result, StoreError>;
 
     static constexpr int schemaVersion = 1;
-    // One statement for many rows: AUTOINCREMENT keeps its books once a statement, which costs as much as a row.
+    // One statement inserts many rows: AUTOINCREMENT does its accounting once for each statement, which costs as much
+    // as a row.
     static constexpr std::size_t rowsAtOnce = 16;
-    // For how long a program that locks the database may hold up the store.
+    // How long a program that locks the database may delay the store.
     static constexpr std::chrono::milliseconds longestWaitForLock{2000};
 
-    // Opens the file, or makes it. One that is corrupt or newer is left as it is.
+    // Opens the file, or makes it. A file that is corrupt or of a later version stays as it is.
     [[nodiscard]] static Expected<std::unique_ptr<EventDatabase>> open(const std::filesystem::path& path);
     EventDatabase(const EventDatabase&) = delete;
     EventDatabase& operator=(const EventDatabase&) = delete;
     ~EventDatabase();
 
-    // Whether another file, or none, now stands at the path, so that what is written here reaches nobody.
+    // Whether the path now leads to another file or to none, so that no reader finds what is written here.
     [[nodiscard]] bool wasReplaced() const;
 
     [[nodiscard]] Expected<> setSynchronization(StoreSynchronization synchronization);
 
-    // What is inserted between `begin` and `commit` is kept whole or not at all; `rollBack` drops it.
+    // Inserts between `begin` and `commit` are kept together or not at all; `rollBack` drops them.
     [[nodiscard]] Expected<> begin();
     [[nodiscard]] Expected<> insert(std::span<const EventRow> rows);
     [[nodiscard]] Expected<> commit();
     void rollBack();
 
-    // The write-ahead log as it was after the last commit.
+    // The size of the write-ahead log after the last commit.
     [[nodiscard]] std::uint64_t logBytes() const noexcept { return logPages_ * pageSize_; }
-    // Moves what the log holds to the database, as far as readers let it; with a wait it holds up the writer, but
-    // no reader, until those are done that are in the way now. True when nothing is left to move and no reader
-    // needs the log, so that it begins anew. False with an error of the disk too: a log can be moved later.
+    // Moves the log to the database, as far as readers allow. With a wait it blocks the writer, but no reader, until
+    // the readers in its way have finished. True if all was moved and no reader needs the log, so that the next commit
+    // starts it again. False also after an error of the disk: a log can be moved later.
     [[nodiscard]] bool emptyLog(std::chrono::milliseconds wait = {});
 
     struct Size {
         std::uint64_t usedBytes = 0;
-        std::uint64_t freeBytes = 0; // within the file
+        std::uint64_t freeBytes = 0; // room in the file that no event uses
     };
     [[nodiscard]] Expected<Size> size();
-    // Deletes, of the `most` oldest events, those from before that time. Returns how many.
+    // Of the `most` oldest events, deletes those before that time. Returns their number.
     [[nodiscard]] Expected<std::uint64_t> deleteBefore(double time, std::uint64_t most);
-    // Deletes the oldest events, as many as take so many bytes, but at most so many. Returns how many.
+    // Deletes the oldest events until they have freed so many bytes, but at most `most` of them. Returns their number.
     [[nodiscard]] Expected<std::uint64_t> deleteOldest(std::uint64_t bytes, std::uint64_t most);
-    // Gives free room of the file back to the file system, at most so much.
+    // Returns free room of the file to the file system, at most so many bytes.
     [[nodiscard]] Expected<> shrink(std::uint64_t mostBytes);
 
 private:
@@ -92,7 +93,7 @@ private:
     [[nodiscard]] Expected<> execute(const char* sql);
     [[nodiscard]] Expected<std::int64_t> number(const char* sql);
     [[nodiscard]] Expected<Statement> prepare(std::string_view sql);
-    // Runs the statement to its first row, or to its end; it is then ready for the next time.
+    // Runs the statement to its first row or to its end, and resets it.
     [[nodiscard]] Expected<> run(const Statement& statement);
     [[nodiscard]] Expected<std::uint64_t> runAndCountChanges(const Statement& statement);
     static void bind(const Statement& statement, int firstParameter, const EventRow& row);
@@ -100,7 +101,7 @@ private:
     const std::filesystem::path path_;
     FileDescriptor directoryLock_;
     std::unique_ptr<sqlite3, CloseConnection> connection_;
-    std::uint64_t device_ = 0; // which file it is, whatever it is called
+    std::uint64_t device_ = 0; // with the inode, identifies the file under any name
     std::uint64_t inode_ = 0;
     std::uint64_t pageSize_ = 0;
     std::uint64_t logPages_ = 0;

@@ -1,7 +1,8 @@
-// What makes events last, behind the store: it opens its place, keeps batches of events, tidies up, and closes its
-// place when it goes. The store decides when each happens; how and where events are kept is the keeper's matter alone.
+// The part behind the store that keeps events: it opens its place, keeps batches of events, tidies up, and closes its
+// place when it is destroyed. The store decides when each happens; the keeper alone decides how and where it keeps
+// events.
 //
-// Another engine is one file that implements this, and one line in LinuxPlatform that makes it.
+// Another engine needs one file that implements this, and the line in LinuxPlatform that makes it.
 #pragma once
 
 #include "platform/EventBatch.h"
@@ -12,7 +13,7 @@
 
 namespace platform {
 
-// One thread, but for the counts. What fails is the keeper's to log and to count.
+// One thread, except for the counts. The keeper logs and counts its own failures.
 class EventKeeper {
 public:
     EventKeeper() = default;
@@ -20,20 +21,20 @@ public:
     EventKeeper(const EventKeeper&) = delete;
     EventKeeper& operator=(const EventKeeper&) = delete;
 
-    // For how long and how many events are kept, and how safely. Before anything else, and whenever it changes.
+    // For how long and how safely events are kept, and how many. Called first, and after every change.
     virtual void setConfiguration(const AnalyticsConfiguration& configuration) = 0;
-    // Makes the place for events, so that it is there before the first.
+    // Makes the place for events. Called before the first event.
     virtual void open() = 0;
-    // Keeps the events, in their order, all or none of them; they last, or are counted as lost, when this returns.
-    // One whose payload JSON cannot say is lost alone.
+    // Keeps all the events, in their order, or none. When it returns, they are kept or counted as lost. A payload that
+    // JSON cannot express is lost alone.
     virtual void keep(EventBatch& events) = 0;
-    // Whether some tidying waits for a quiet moment.
+    // Whether some tidying waits until the store is quiet.
     [[nodiscard]] virtual bool awaitsQuiet() const = 0;
-    // Does some of the tidying that is due, removing what is too old or too much; true when more is left to do.
-    // `isQuiet`: nothing is to be kept now.
+    // Does a part of the tidying that is due: removes events that are too old or too many. True if more is left to do.
+    // `isQuiet`: no events wait now.
     virtual bool tidy(bool isQuiet) = 0;
 
-    // How many events were kept since the start, and how many were lost for that reason. Any thread.
+    // The number of events kept since the start, and of those lost for that reason. Any thread.
     [[nodiscard]] virtual std::uint64_t keptEvents() const noexcept = 0;
     [[nodiscard]] virtual std::uint64_t lostEvents(StoreError reason) const noexcept = 0;
 };

@@ -1,5 +1,4 @@
-// What was counted and not told yet is told at the end at the latest: no loss goes unsaid because the service went
-// first.
+// The destructor reports the losses that are not reported yet, so that none is forgotten when the service ends.
 #include "platform/linux/store/EventLosses.h"
 
 namespace platform {

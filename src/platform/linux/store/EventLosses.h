@@ -1,5 +1,5 @@
-// Counts the events that could not be kept, by reason, and tells the owner: at the first loss of a kind, and then
-// once a minute while it lasts, so that a full disk does not fill up the log as well.
+// Counts the events that could not be kept, by reason, and logs them: at the first loss of a kind, and then once a
+// minute while losses go on, so that a full disk does not also fill the log.
 #pragma once
 
 #include "platform/Clock.h"
@@ -13,28 +13,28 @@
 
 namespace platform {
 
-// One thread, but for `count`.
+// One thread, except for `count`.
 class EventLosses {
 public:
     static constexpr double secondsBetweenLines = 60;
 
-    // The path is that of the database, for the log.
+    // The path is that of the database; the log names it.
     EventLosses(std::filesystem::path path, const Clock& clock, ProviderLog log)
         : path_(std::move(path)),
           clock_(clock),
           log_(log)
     {
     }
-    // Tells what has not been told.
+    // Reports the remaining losses.
     ~EventLosses();
     EventLosses(const EventLosses&) = delete;
     EventLosses& operator=(const EventLosses&) = delete;
 
     void add(StoreError reason, std::uint64_t events);
-    // Tells what has not been told, of each reason that was not told of within the last minute.
+    // Reports new losses, except for reasons that were reported within the last minute.
     void report();
 
-    // How many were lost for that reason since the start. Any thread.
+    // The number of events lost for that reason since the start. Any thread.
     [[nodiscard]] std::uint64_t count(StoreError reason) const noexcept
     {
         return losses_[static_cast<std::size_t>(reason)].events;
@@ -44,7 +44,7 @@ private:
     struct Loss {
         std::atomic<std::uint64_t> events = 0;
         std::uint64_t told = 0;
-        double toldAt = 0; // uptime, in seconds
+        double toldAt = 0; // the time of the last report (uptime, in seconds)
     };
 
     void tell(StoreError reason, Loss& loss);

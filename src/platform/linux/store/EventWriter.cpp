@@ -1,5 +1,5 @@
-// What to do when the database cannot do what it should: try again later, set it aside, or count the loss. Nothing
-// here gives up for good.
+// What to do when the database fails: try again later, set it aside, or count the loss. The writer never gives up for
+// good.
 #include "platform/linux/store/EventWriter.h"
 
 #include <algorithm>
@@ -14,7 +14,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr std::uint64_t bytesOfARow = 24; // beside its texts, roughly
+constexpr std::uint64_t bytesOfARow = 24; // besides its texts, roughly
 constexpr std::uint64_t bytesTidiedAtOnce = 1024 * 1024;
 constexpr double secondsADay = 86400;
 
@@ -26,7 +26,7 @@ fs::path withSuffix(const fs::path& path, std::string_view suffix)
 constexpr std::string_view damagedMark = ".corrupt-";
 constexpr std::string_view newerMark = ".newer-";
 
-// What SQLite has beside a database, under the same name and these ends.
+// The files that SQLite keeps beside a database, by the ends of their names.
 constexpr std::array<std::string_view, 2> companions = {"-wal", "-shm"};
 
 } // namespace
@@ -42,7 +42,7 @@ EventWriter::EventWriter(const fs::path& directory, const Clock& clock, Provider
 void EventWriter::setConfiguration(const AnalyticsConfiguration& configuration)
 {
     configuration_ = configuration;
-    hasMoreToTidy_ = true; // perhaps
+    hasMoreToTidy_ = true; // the new limits may be lower
     if (database_)
         if (const auto done = database_->setSynchronization(configuration_.synchronization); !done)
             handleFailure(done.error());
@@ -95,7 +95,7 @@ EventWriter::Expected<> EventWriter::openAnew()
     return database_->setSynchronization(configuration_.synchronization);
 }
 
-// Renames the database, which is closed. One that is newer is good, and is never removed.
+// Renames the database, which must be closed. One of a later version is good, so it is never removed.
 bool EventWriter::setAside(StoreError reason)
 {
     const bool isNewer = reason == StoreError::Newer;
@@ -124,7 +124,7 @@ bool EventWriter::setAside(StoreError reason)
 
 void EventWriter::removeOldestDamaged()
 {
-    std::set<fs::path> damaged; // oldest first, for the time is in the name
+    std::set<fs::path> damaged; // oldest first, because the time is in the name
     std::error_code error;
     for (fs::directory_iterator file(path_.parent_path(), error); file != end(file); file.increment(error)) {
         const std::string name = file->path().filename();
@@ -150,7 +150,7 @@ void EventWriter::keep(EventBatch& events)
     losses_.add(StoreError::NotJson, events.size() - rows.size());
     auto done = write(rows);
     if (!done && done.error() == StoreError::Corrupt)
-        done = write(rows); // into the new one
+        done = write(rows); // now into a new database
     if (done)
         kept_ += rows.size();
     else
@@ -186,11 +186,11 @@ void EventWriter::handleFailure(StoreError error)
     if (database_)
         database_->rollBack();
     if (error == StoreError::DiskFull || error == StoreError::Locked || error == StoreError::LogHeld)
-        return; // the connection is as good as before
+        return; // the connection can still be used
     const bool wasOpen = database_ != nullptr;
     database_.reset();
     if (error == StoreError::Corrupt && wasOpen)
-        setAside(error); // where that fails, the next opening finds it damaged again
+        setAside(error); // if that fails, the next opening finds it damaged again
 }
 
 // --- Housekeeping
@@ -206,16 +206,16 @@ bool EventWriter::tidy(bool isQuiet)
     if (!database_)
         return false;
     if (database_->logBytes() < logBytesAtCheckpoint_)
-        logBytesAtCheckpoint_ = 0; // it began anew
+        logBytesAtCheckpoint_ = 0; // the log started again
     if (isLogLongerBy(isQuiet ? logBytesBetweenCheckpoints : mostLogBytesBetweenCheckpoints))
         emptyLog();
     const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
         || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
-    hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && makeRoom(); // which makes the log longer
+    hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && makeRoom(); // deleting makes the log longer
     return hasMoreToTidy_;
 }
 
-// Than at the last checkpoint.
+// Longer than at the last checkpoint.
 bool EventWriter::isLogLongerBy(std::uint64_t bytes) const
 {
     return database_->logBytes() >= logBytesAtCheckpoint_ + std::min(bytes, maximumBytes() / 4);
@@ -232,13 +232,13 @@ bool EventWriter::emptyLog()
     return isEmpty;
 }
 
-// Makes more room than was taken since the last time, so that it keeps up, but not all of it at once. True when more
-// is left to do.
+// Frees more room than events have taken since the last call, so that it keeps up, but only a part of all that is due.
+// True if more is left to do.
 bool EventWriter::makeRoom()
 {
     const std::uint64_t mostFreed = 2 * std::exchange(bytesSinceCheck_, 0) + bytesTidiedAtOnce;
     checkedAt_ = clock_.systemUptime();
-    // Deleting turns used room into free room, and shrinking free room into none.
+    // Deleting turns used room into free room, and shrinking turns free room into none.
     const auto room = [](const EventDatabase::Size& size) { return 2 * size.usedBytes + size.freeBytes; };
     auto size = database_->size();
     const std::uint64_t roomBefore = size ? room(*size) : 0;
@@ -253,7 +253,7 @@ bool EventWriter::makeRoom()
     return size.has_value();
 }
 
-// False when nothing is left to do.
+// False if nothing is left to do.
 EventWriter::Expected<bool> EventWriter::makeSomeRoom(const EventDatabase::Size& size)
 {
     const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
@@ -262,7 +262,7 @@ EventWriter::Expected<bool> EventWriter::makeSomeRoom(const EventDatabase::Size&
         : database_->deleteBefore(tooOld, eventsDeletedAtOnce);
     if (!deleted)
         return std::unexpected(deleted.error());
-    // New events fill what old ones left free; the file shrinks only where far too much is free.
+    // New events fill the room of deleted ones; the file shrinks only if far too much of it is free.
     const bool isFileTooLarge = size.usedBytes + size.freeBytes > maximumBytes() + maximumBytes() / 8;
     if (*deleted > 0 || !isFileTooLarge || size.freeBytes == 0)
         return *deleted > 0;

@@ -1,5 +1,5 @@
-// Keeps events in an SQLite database, come what may: a damaged database is set aside and a new one begun, what cannot
-// be kept is counted and told, and what is too old or too much goes.
+// Keeps events in an SQLite database in spite of all failures: it sets a damaged database aside and makes a new one,
+// counts and logs the events that it cannot keep, and removes those that are too old or too many.
 #pragma once
 
 #include "platform/Clock.h"
@@ -17,23 +17,24 @@
 
 namespace platform {
 
-// One thread, but for the counts.
+// One thread, except for the counts.
 class EventWriter final : public EventKeeper {
 public:
     static constexpr std::string_view fileName = "analytics.sqlite3";
     static constexpr std::size_t mostDamagedKept = 3; // databases set aside; older ones are removed
     static constexpr double secondsBetweenOpenings = 1; // of a database that could not be opened
-    // How long the write-ahead log gets before it is moved to the database in a quiet moment, and before it is moved
-    // come what may, unless a quarter of the bound of size is less. The next commit waits until it is moved, which
-    // takes about as long as writing the log did.
+    // The length at which the write-ahead log is moved to the database in a quiet moment, and the length at which it is
+    // moved in any case; a quarter of the size limit if that is less. The next commit waits meanwhile, about as long as
+    // writing the log took.
     static constexpr std::uint64_t logBytesBetweenCheckpoints = 8 * 1024 * 1024;
     static constexpr std::uint64_t mostLogBytesBetweenCheckpoints = 4 * logBytesBetweenCheckpoints;
-    // When the log is longer than half the bound of size, because readers keep it from beginning anew, the writer
-    // waits for them so long; when that was in vain, not again for a while. A log as long as the bound takes no more.
+    // If readers keep the log from starting again and it is longer than half the size limit, the writer waits for them
+    // for this time; after a wait in vain, it does not wait again for a while. A log longer than the size limit gets no
+    // more events.
     static constexpr std::chrono::milliseconds waitForReaders{200};
     static constexpr double secondsBetweenWaits = 2;
-    // The bounds of age and size are looked after when so much was kept, or so much time went by. What goes then,
-    // goes in transactions of so many events.
+    // The limits of age and size are checked after so many bytes or so much time. Events are then deleted in
+    // transactions of so many.
     static constexpr std::uint64_t bytesBetweenChecks = 1024 * 1024;
     static constexpr double secondsBetweenChecks = 60;
     static constexpr std::uint64_t eventsDeletedAtOnce = 512;
@@ -77,7 +78,7 @@ private:
     double openAgainAt_ = 0; // here and below: uptime, in seconds
     std::uint64_t logBytesAtCheckpoint_ = 0;
     double waitForReadersAt_ = 0;
-    double checkedAt_ = 0; // the bounds of age and size
+    double checkedAt_ = 0; // the last check of age and size
     std::uint64_t bytesSinceCheck_ = 0;
     bool hasMoreToTidy_ = true;
 };

@@ -1,4 +1,4 @@
-// All that an owner is told about the store's troubles, side by side: each with what to do.
+// All messages about the store's troubles for its owner, each with what to do.
 #include "platform/linux/store/StoreError.h"
 
 namespace platform {

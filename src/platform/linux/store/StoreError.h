@@ -1,4 +1,4 @@
-// Why the analytics store could not do something, in words that help its owner.
+// Why the analytics store failed, in words that help its owner.
 #pragma once
 
 #include <cstddef>
@@ -10,13 +10,13 @@ namespace platform {
 enum class StoreError : std::uint8_t {
     DiskFull,
     ReadOnly,
-    Locked, // another program writes to the database, and did not end in time
+    Locked, // another program locks the database for too long
     InUse, // another process keeps its events in this directory
     CannotOpen,
     InputOutput,
-    Corrupt, // or no database, or a database of something else
+    Corrupt, // or not a database of events
     Newer, // made by a later version of the service
-    LogHeld, // somebody reads for so long that the write-ahead log met its limit
+    LogHeld, // a reader kept the write-ahead log until it reached its limit
     NotJson, // the payload holds NaN or infinity
     Other
 };

@@ -1,4 +1,4 @@
-// Names repeat and patterns rarely change: each thread remembers what it was told, and under which patterns.
+// Names repeat and patterns rarely change, so each thread remembers its last answers, with the version of the patterns.
 #include "platform/linux/store/UsedEventNames.h"
 
 #include "platform/linux/store/AnalyticsConfiguration.h"
@@ -16,14 +16,14 @@ struct RememberedAnswer {
     bool isUsed = false;
 };
 
-// Where the answer about a name is, if it was not driven away by another name.
+// The place of the answer about the name; another name's answer may stand there.
 RememberedAnswer& rememberedAnswer(std::string_view name)
 {
     thread_local std::array<RememberedAnswer, UsedEventNames::answersRemembered> answers;
     return answers[std::hash<std::string_view>()(name) % answers.size()];
 }
 
-// One that was never there before, in this process.
+// A version that was never used before in this process.
 std::uint64_t newVersion()
 {
     static std::atomic<std::uint64_t> last = 0;

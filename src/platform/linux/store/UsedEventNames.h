@@ -1,4 +1,4 @@
-// Which analytics events are wanted: patterns, and the answers that a thread was given last.
+// Decides which analytics events the service keeps: the patterns, and the last answers of each thread.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -15,7 +15,7 @@ namespace platform {
 // Any thread.
 class UsedEventNames {
 public:
-    // Each by a hash of its name; one that was driven away is worked out anew.
+    // The hash of a name gives the place of its answer; an answer that another name replaced is computed again.
     static constexpr std::size_t answersRemembered = 128;
 
     UsedEventNames();

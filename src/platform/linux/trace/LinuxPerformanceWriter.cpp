@@ -78,8 +78,8 @@ public:
     }
 
 private:
-    // The length alone tells most of what does not fit: reading a long name once for each value that is lost would take
-    // minutes. As JSON text a name is longer yet, so one that did not fit leaves room only for shorter ones.
+    // The length alone rejects nearly all names that do not fit: reading a long name again for each lost value would
+    // take minutes. As JSON text a name is even longer, so a name that did not fit leaves room only for shorter ones.
     bool hasRoomFor(std::string_view name)
     {
         if (room_ < name.size() + mostBesideName)

@@ -1,5 +1,5 @@
-// Every length is checked against the rest of the page; the first that does not fit ends the page, because the records
-// behind it cannot be found any more.
+// Every length is checked against the rest of the page. The first wrong one ends the page, because the following
+// records cannot be found.
 #include "platform/linux/trace/RingBufferPage.h"
 
 namespace platform {

@@ -21,7 +21,7 @@ struct RingBufferPageFormat {
     std::size_t dataOffset = 16;
 };
 
-// What stands at that place, which the bytes must hold, in the processor's own form.
+// The number at that place, in the processor's own form; all its bytes must be there.
 template <typename Field> Field fieldAt(std::span<const std::byte> bytes, std::size_t offset) noexcept
 {
     Field field{};

@@ -46,7 +46,7 @@ private:
 
     const RingBufferPageFormat format_;
     const std::uint16_t recordType_;
-    std::vector<std::vector<CollectedEvent>> streams_; // one a processor, each in the order of time
+    std::vector<std::vector<CollectedEvent>> streams_; // one for each processor, in the order of time
     std::vector<CollectedEvent> merged_;
     std::vector<CollectedEvent> merging_; // the result of a merge
     std::vector<std::size_t> runs_; // the begins of the ordered parts of `merged_`, and its end

@@ -1,4 +1,4 @@
-// One write, whose failure is ignored: the event is then lost.
+// One write. If it fails, the event is lost.
 #include "platform/linux/trace/TracefsEmitter.h"
 
 #include "platform/linux/trace/EmitterInterface.h"

@@ -85,7 +85,7 @@ std::optional<std::size_t> numberBehind(std::string_view text, std::string_view 
     return number;
 }
 
-// How many bytes the kernel returns at once.
+// How many bytes one read returns.
 std::size_t pageSize(const fs::path& instance)
 {
     constexpr std::size_t most = 1024; // kilobytes
@@ -149,7 +149,7 @@ std::expected<void, TracefsFailure> TracefsInstance::setUp(const fs::path& path)
 
 std::expected<void, TracefsFailure> TracefsInstance::readFormats(const fs::path& path)
 {
-    // Kernel files, whose size is known only after reading.
+    // For files of the kernel: their size is known only after reading.
     const auto read = [&](const char* name) {
         std::ostringstream text;
         text << std::ifstream(path / name).rdbuf();
