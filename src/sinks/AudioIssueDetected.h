@@ -45,7 +45,7 @@ public:
     void setRtaidclient(std::string_view rtaidclient) { rtaidclient_ = rtaidclient; }
 
     friend void swap(AudioIssueDetected& left, AudioIssueDetected& right) noexcept;
-    // A time stamp of 0 differs from one that is not set.
+    // A time stamp of 0 differs from a missing one.
     friend bool operator==(const AudioIssueDetected& left, const AudioIssueDetected& right) noexcept;
     friend std::size_t hash_value(const AudioIssueDetected& record) noexcept;
 

@@ -10,7 +10,7 @@ namespace {
 constexpr AudioEventType typeGimbo = 8;
 constexpr std::string_view hapticTimeKey = "Haptic_Active_Hardware_Time_Seconds";
 
-// A message that goes to several sessions is one report, though it may hold a NaN, which equals nothing.
+// A message that goes to several sessions is one report, even if it holds a NaN, which equals nothing.
 bool isRepeat(const foundation::Dictionary& message, const foundation::Dictionary& last)
 {
     return message.isSameObject(last) || message == last;

@@ -1,5 +1,5 @@
-// Watches for haptics hardware that keeps running: when a second, different report of haptic hardware time comes
-// after a first one, a session has probably leaked, and the bug-capture service is asked for a snapshot.
+// Watches for haptics hardware that keeps running: if a second, different report of haptic hardware time comes after a
+// first one, a session has probably leaked, and this class requests a snapshot from the bug-capture service.
 #pragma once
 
 #include "platform/BugCapture.h"

@@ -8,7 +8,7 @@
 
 #include <cstddef>
 
-// One thread at a time; different lists may be used from different threads at once.
+// One thread at a time; different threads may use different lists at the same time.
 class TraceEvents {
 public:
     static constexpr std::size_t firstRoom = 10'000; // in events

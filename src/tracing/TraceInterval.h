@@ -1,7 +1,7 @@
 // The time from an event of one code to the next event of another: on the same thread, or on any thread.
 //
-// A start that is followed by another start, and a stop without a start, are discarded and counted. An event whose code
-// begins and ends the interval begins it.
+// A start that is followed by another start, and a stop without a start, are discarded and counted. If both codes are
+// the same, their event begins the interval.
 #pragma once
 
 #include "tracing/TraceData.h"

@@ -25,7 +25,7 @@ struct TraceParams;
 // drops them and does not write. One thread.
 class TraceRunner {
 public:
-    // How many runners may exist at once, because each has a thread; a caller checks this before it makes one.
+    // How many runners may exist at the same time, because each has a thread; a caller checks this before it makes one.
     static constexpr std::size_t mostAtOnce = 64;
     [[nodiscard]] static std::size_t numberOfRunners() noexcept;
 

@@ -26,7 +26,7 @@ void TraceRunner::writeQuilldat()
     perfWriter_ = platform::current().performanceWriter.open(directory / resultsFileName, projectName, resultsVersion_);
     if (!perfWriter_) {
         KESTO_LOG(KestoReportingTraceCategory(), Info, "Failed to open quilldat writer");
-        std::_Exit(exitStatus); // at once, because other threads are running; acknowledged events are kept already
+        std::_Exit(exitStatus); // immediately, because other threads are running; acknowledged events are kept already
     }
     for (const auto& traceWithResults : traceResults_) {
         printTraceResults(traceWithResults);

@@ -21,7 +21,7 @@ namespace utility {
 
 // The payload key of the time that a client gives a message, in seconds since 1970.
 constexpr std::string_view timestampKey = "kestoreporting_timestamp";
-// The configuration and payload key of the application on whose behalf a client plays.
+// The configuration and payload key of the application for which a client plays.
 constexpr std::string_view hostApplicationKey = "HostApplicationDisplayID";
 
 // A condition variable with its own lock.
@@ -51,8 +51,8 @@ void KestoReportingUtilitySignal(utility::ConditionWithLock& condition, bool& fl
 // The host application in the dictionary, or "Unknown".
 [[nodiscard]] foundation::Value KestoReportingUtilityRetrieveAppName(const foundation::Dictionary& dictionary);
 
-// The next three are the definition of what is done to a message; sessions call the one behind them, which the property
-// `NormalisedMessage.IsWhatTheThreeStepsMakeOfIt` binds to them.
+// The next three functions define what happens to a message. Sessions call the fourth one; the property
+// `NormalisedMessage.IsWhatTheThreeStepsMakeOfIt` binds it to the three.
 //
 // The payload with "audiotag" set to the names of its category and type, such as "PlaybackStart".
 [[nodiscard]] foundation::Dictionary KestoReportingUtilityAddAudioMessageTag(const foundation::Dictionary& message,

@@ -1,4 +1,4 @@
-// Where the queue is kept.
+// The place of the queue.
 #include "utility/ServerQueue.h"
 
 #include "platform/Platform.h"

@@ -1,5 +1,5 @@
-// The server queue: the one serial queue on which everything runs that touches clients and sessions, so that
-// none of it needs a lock.
+// The server queue: the one serial queue for everything that touches clients and sessions, so that none of it needs a
+// lock.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -12,14 +12,14 @@ constexpr std::string_view gReportingQueueName = "com.quarn.kesto.reporting.serv
 
 namespace utility {
 
-// Makes the queue, in place of the one before. Before any client is accepted.
+// Makes the queue, in place of an earlier one. Call it before the first client is accepted.
 void createServerQueue();
 
 // The queue. Any thread.
 [[nodiscard]] const std::shared_ptr<platform::TurnQueue>& serverQueue();
 
-// In debug builds, ends the process when what belongs on the server queue is called from elsewhere. Where there is no
-// server queue, as in a program that drives sessions by itself, one thread may stand for it.
+// In debug builds, ends the process if it is called outside the server queue. Without a server queue, as in a program
+// that drives sessions directly, one thread may take its place.
 inline void assertServerQueue()
 {
     assert(serverQueue() == nullptr || serverQueue()->isCurrent());

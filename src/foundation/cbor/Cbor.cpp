@@ -84,7 +84,8 @@ std::size_t headSize(std::uint64_t argument) noexcept
     return argument <= std::numeric_limits<std::uint32_t>::max() ? 5 : longestHead;
 }
 
-// What an encoding is made of goes to memory, or is only counted: so its size is known before there is memory for it.
+// Writes the parts of an encoding to memory, or only counts their bytes: so the size is known before memory is
+// allocated for it.
 struct Place {
     char* at;
 
@@ -302,8 +303,8 @@ private:
     std::vector<String> own_; // all of them, once one was not expected
 };
 
-// The elements of the containers that are being read, one container after the other. One vector a thread and not one a
-// decoder, because every client has a decoder.
+// The elements of the containers that are being read, one container after the other. Each thread has one vector; one
+// for each decoder would cost memory for every client.
 std::vector<Value>& unfinishedValues()
 {
     thread_local std::vector<Value> values;
@@ -312,8 +313,8 @@ std::vector<Value>& unfinishedValues()
 
 } // namespace
 
-// Reads one item after the other. The first error empties the rest, so that every loop ends by itself, and
-// is what `readAll` returns.
+// Reads one item after the other. The first error empties the rest, so that every loop ends; `readAll` returns this
+// error.
 class CborReader {
 public:
     CborReader(std::string_view bytes, CborDecoder& decoder) : rest_(bytes), decoder_(decoder)
@@ -373,7 +374,7 @@ private:
         const auto byte = static_cast<std::uint8_t>(rest_.front());
         rest_.remove_prefix(1);
         Head head{static_cast<Major>(byte >> 5), static_cast<std::uint8_t>(byte & 0x1F), byte & 0x1FU};
-        if (head.additional >= 24) // the number stands behind
+        if (head.additional >= 24) // the number follows the first byte
             readArgument(head);
         return head;
     }
@@ -455,7 +456,7 @@ private:
             if (chunk.major != head.major || chunk.isIndefinite())
                 return fail(CborError::Malformed);
             const std::string_view bytes = take(chunk.argument);
-            if (head.major == Major::Text && !isValidUtf8(bytes)) // each chunk is text by itself
+            if (head.major == Major::Text && !isValidUtf8(bytes)) // each chunk alone must be text
                 return fail(CborError::InvalidUtf8);
             chunks_ += bytes;
         });
@@ -524,7 +525,7 @@ private:
     {
         if (head.argument != epochDateTag)
             return refuse(CborError::Unsupported);
-        const auto seconds = readScalar(readHead()).number(); // never another tag, or tags would nest without end
+        const auto seconds = readScalar(readHead()).number(); // no further tag: tags could nest without end
         if (!seconds || seconds->kind() == Number::Kind::Boolean)
             return refuse(CborError::Malformed);
         return Date{seconds->doubleValue()};
@@ -547,7 +548,7 @@ namespace {
 // Eight characters at a time; the last eight may overlap the eight before.
 std::uint64_t hashOf(std::string_view key) noexcept
 {
-    constexpr std::uint64_t multiplier = 0x9E3779B97F4A7C15; // odd, its bits well mixed
+    constexpr std::uint64_t multiplier = 0x9E3779B97F4A7C15; // odd, with well mixed bits
     std::uint64_t hash = key.size();
     const auto add = [&hash](const char* bytes, std::size_t count) {
         std::uint64_t word = 0;

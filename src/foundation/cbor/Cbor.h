@@ -1,9 +1,7 @@
-// Values as CBOR (RFC 8949): the language of the wire, and the compact form in which a session keeps its
-// messages.
+// Values as CBOR (RFC 8949): the format of the wire, and the compact form in which a session keeps its messages.
 //
-// The reader is the project's own and not a library's, because the same few lines decode a frame from a hostile client,
-// remember the keys that a client repeats in every message, and walk a recorded payload without unpacking it; the
-// benchmarks compare it with libcbor.
+// The reader is the project's own, because the same few lines decode a frame from a hostile client, remember the keys
+// that every message repeats, and walk a recorded payload without unpacking it. The benchmarks compare it with libcbor.
 //
 // Null, booleans, integers, floats (16 bits are read as 32), text, arrays, maps with text keys, byte strings
 // (data) and epoch-based dates (tag 1) have a value; lengths may be indefinite. Everything else is refused.
@@ -42,7 +40,7 @@ constexpr unsigned cborMaximumDepth = 32;
 void appendCbor(const Value& value, std::string& out);
 void appendCbor(const Dictionary& dictionary, std::string& out);
 
-// How many bytes that encoding takes, and the encoding where there is room for so many; returns where it ends.
+// The size of that encoding in bytes; and the encoding, written to memory that has room for it: returns the end.
 [[nodiscard]] std::size_t cborSize(const Dictionary& dictionary) noexcept;
 char* putCbor(const Dictionary& dictionary, char* place) noexcept;
 
@@ -56,8 +54,8 @@ inline void appendCborNull(std::string& out)
     out.push_back('\xF6');
 }
 
-// Decodes items from foreign bytes. One decoder a connection, used by one thread at a time: it remembers short keys and
-// the shapes of small maps, so that keys that every message repeats are made once.
+// Decodes items from foreign bytes. Each connection has one decoder. It remembers short keys and the shapes of small
+// maps, so that keys that every message repeats are made only once. One thread at a time.
 class CborDecoder {
 public:
     // Decodes the bytes, which hold exactly one item with at most so many nested containers.

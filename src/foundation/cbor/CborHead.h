@@ -33,8 +33,8 @@ template <typename Integer> [[nodiscard]] Integer cborBigEndian(const char* byte
     return std::endian::native == std::endian::little ? std::byteswap(value) : value;
 }
 
-// The number, if the head holds it completely; nothing for any other head. Floats of 16 bits, which we never write, and
-// integers below -2^63 are left to the reader.
+// The number, if the head holds it completely; nothing for any other head. The reader itself handles floats of 16 bits,
+// which the service never writes, and integers below -2^63.
 [[nodiscard]] inline std::optional<Number> cborNumber(const CborHead& head) noexcept
 {
     const bool fitsSigned = std::in_range<std::int64_t>(head.argument);

@@ -25,7 +25,7 @@ public:
     static CborItem at(const char* place) noexcept { return CborItem({place, sizeAt(place)}); }
 
     [[nodiscard]] std::string_view bytes() const noexcept { return bytes_; }
-    // Whether both have the same bytes, and so say the same. At the same place they need not be looked at.
+    // Whether both have the same bytes, and so the same value. Equal addresses mean this without a comparison.
     [[nodiscard]] bool isSameAs(CborItem other) const noexcept
     {
         return bytes_.size() == other.bytes_.size() && (bytes_.data() == other.bytes_.data() || bytes_ == other.bytes_);

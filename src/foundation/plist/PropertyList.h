@@ -1,8 +1,8 @@
 // Property lists: the files in which people and programs describe things as dictionaries of dictionaries, written as
 // XML, in UTF-8 or UTF-16, or in a binary form.
 //
-// Any program may write such a file. So everything that a file can make grow has a limit, the readers fetch nothing
-// that it names, and they refuse a file that is not exactly a property list and report the place of the error.
+// Any program may write such a file. So everything that a file can make grow has a limit. The readers fetch nothing
+// that a file names. They refuse a file that is not exactly a property list, and report the place of the error.
 //
 // The values: integers are signed of 64 bits, or unsigned where only that holds them; reals are floats of 64 bits, in
 // the binary form also of 32; a UID, which only the binary form has, is the dictionary that the XML form writes for it,

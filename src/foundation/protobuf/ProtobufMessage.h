@@ -10,7 +10,7 @@
 
 namespace foundation {
 
-// Plain data. Distinct messages may be used from different threads at once.
+// Plain data. Different threads may use distinct messages at the same time.
 class ProtobufMessage {
 public:
     virtual ~ProtobufMessage() = default;

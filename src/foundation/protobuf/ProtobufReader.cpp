@@ -1,5 +1,5 @@
 // Each step takes something from the front and returns whether it was complete. The first step that fails empties the
-// rest, so that every loop ends by itself.
+// rest, so that every loop ends.
 #include "foundation/protobuf/ProtobufReader.h"
 
 #include <array>
@@ -28,8 +28,8 @@ bool ProtobufReader::fail(ProtobufError error) noexcept
     return false;
 }
 
-// Seven bits a byte, the lowest first; the highest bit of a byte says that another one follows. A number may be
-// written longer than it needs to be, but not longer than the largest of its type.
+// Each byte holds seven bits, the lowest first; its highest bit says that another byte follows. A number may have more
+// bytes than it needs, but not more than the largest number of its type.
 template <typename Integer> bool ProtobufReader::takeLongVarint(Integer& value) noexcept
 {
     constexpr int bits = std::numeric_limits<Integer>::digits;

@@ -1,5 +1,5 @@
 // Reading the wire format of protocol buffers, in which a message is a row of fields: a number, a wire type, and a
-// value whose length the wire type determines.
+// value with a length that the wire type determines.
 //
 // The reader returns field by field, each with its whole value, so that a caller picks the fields that it knows and can
 // ignore the others. It copies and allocates nothing: text lies in the input. It checks every length against the

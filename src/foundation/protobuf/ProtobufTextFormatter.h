@@ -1,5 +1,5 @@
 // Messages of protocol buffers as text for people, in the text format that the protocol's own tools write and read:
-// a field a line, objects in braces and indented.
+// each field is a line, and objects are indented, in braces.
 #pragma once
 
 #include <cstdint>
@@ -15,7 +15,7 @@ public:
     explicit ProtobufTextFormatter(std::string& out) noexcept : out_(out) { }
 
     void beginObject(std::string_view name);
-    void endObject(); // the one begun last
+    void endObject(); // of the last begun object
 
     void format(std::string_view name, std::uint64_t value);
     // In quotation marks; characters that are not printable ASCII become escapes.

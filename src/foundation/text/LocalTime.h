@@ -6,8 +6,8 @@
 
 namespace foundation {
 
-// The moment in the device's time zone, by a chrono format of {fmt} such as "{:%H:%M:%S}". A moment whose year
-// does not have one to four digits is left as the number of seconds. Any thread.
+// The moment in the device's time zone, by a chrono format of {fmt} such as "{:%H:%M:%S}". If the year has not one to
+// four digits, the text is the number of seconds. Any thread.
 [[nodiscard]] std::string localTimeText(double secondsSince1970, std::string_view format);
 
 } // namespace foundation

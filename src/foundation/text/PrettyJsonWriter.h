@@ -1,4 +1,4 @@
-// JSON for people, written piece by piece: indented, one member a line, and never in memory as a whole.
+// JSON for people, written piece by piece: indented, each member on its own line, and never in memory as a whole.
 #pragma once
 
 #include "foundation/cbor/CborView.h"

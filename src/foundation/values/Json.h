@@ -10,8 +10,8 @@
 
 namespace foundation {
 
-// Appends the compact JSON of the value. False, with `out` as it was, when the value holds NaN or infinity, which JSON
-// cannot express. Any thread.
+// Appends the compact JSON of the value. If the value holds NaN or infinity, which JSON cannot express, returns false
+// and leaves `out` as it was. Any thread.
 [[nodiscard]] bool appendJson(const Value& value, std::string& out);
 
 // The same for people: NaN and infinity are written as the bare words nan, inf and -inf.

@@ -38,7 +38,7 @@ public:
     [[nodiscard]] std::int64_t int64Value() const noexcept;
     [[nodiscard]] double doubleValue() const noexcept;
 
-    // The value as an integer of that type, when the number is of an integer kind and in range.
+    // The value as an integer of that type, if the number is of an integer kind and in range.
     template <std::integral Integer> [[nodiscard]] std::optional<Integer> exactly() const noexcept;
 
     // Integers in decimal, booleans 1 and 0, floats the shortest decimal that reads back to the same

@@ -1,4 +1,4 @@
-// One allocation a string, none for the empty one; and UTF-8 checked eight characters at a time.
+// One allocation for each string, and none for the empty one; UTF-8 is checked eight characters at a time.
 #include "foundation/values/String.h"
 
 #include <algorithm>
@@ -39,8 +39,8 @@ std::string_view cutBetweenCharacters(std::string_view text, std::size_t longest
 
 namespace {
 
-// How many bytes the sequence at the start of `bytes` takes, or 0 when it is not well formed.
-// Table 3-7 of the Unicode Standard: the first byte narrows the range of the second.
+// The length in bytes of the sequence at the start of `bytes`, or 0 if it is not well-formed (table 3-7 of the Unicode
+// Standard: the first byte limits the second).
 std::size_t sequenceLength(std::string_view bytes) noexcept
 {
     const auto at = [bytes](std::size_t index) { return static_cast<std::uint8_t>(bytes[index]); };
@@ -68,7 +68,7 @@ bool isValidUtf8(std::string_view bytes) noexcept
     while (!bytes.empty()) {
         if (std::uint64_t word = 0; bytes.size() >= sizeof word) {
             std::memcpy(&word, bytes.data(), sizeof word);
-            if ((word & highBits) == 0) { // eight ASCII characters at once: nearly all text is ASCII
+            if ((word & highBits) == 0) { // eight ASCII characters together: nearly all text is ASCII
                 bytes.remove_prefix(sizeof word);
                 continue;
             }

@@ -1,7 +1,7 @@
-// Immutable shared text; and data, whose bytes need not be text.
+// Immutable shared text; and data, which need not be text.
 //
-// A string has an identity besides its characters: a copy is the same object, a string made anew from equal characters
-// is not. By this identity the service recognises one constant that only code of this process can pass.
+// A string has an identity besides its characters: a copy is the same object, but a new string of equal characters is
+// not. By this identity the service recognises one constant that only code of this process can pass.
 #pragma once
 
 #include "foundation/values/Reference.h"

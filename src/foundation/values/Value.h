@@ -1,8 +1,8 @@
 // The one data type of messages, configurations and preferences: null, number, string, array,
 // dictionary, and the data and dates that property lists have.
 //
-// A value is immutable, 16 bytes, and cheap to copy: strings, arrays and dictionaries are shared. That
-// makes it safe to hand a payload to the store's thread while the session keeps it too.
+// A value is immutable, 16 bytes, and cheap to copy: strings, arrays and dictionaries are shared. So it is safe to hand
+// a payload to the store's thread while the session keeps it too.
 #pragma once
 
 #include "foundation/values/DictionaryShape.h"
@@ -37,7 +37,7 @@ struct Date {
     friend bool operator==(const Date&, const Date&) = default;
 };
 
-// Any thread; distinct copies may be used from different threads at once.
+// Any thread; different threads may use distinct copies at the same time.
 class Value {
 public:
     enum class Kind : std::uint8_t { Null, Number, String, Array, Dictionary, Data, Date };
@@ -113,7 +113,7 @@ public:
     [[nodiscard]] std::string text() const;
     void appendText(std::string& out) const;
 
-    // Roughly how much memory it takes, for bounds; shared parts count in full.
+    // A rough size of its memory, for limits; shared parts count in full.
     [[nodiscard]] std::size_t roughBytes() const noexcept;
 
     // By content; numbers by value, for all kinds.
@@ -142,7 +142,7 @@ private:
 // A shared object with values right behind it, in one allocation.
 class ArrayObject : public ReferenceCounted {
 public:
-    // Moves the values; null pointer when there are none.
+    // Moves the values; null without values.
     static const ArrayObject* create(std::span<Value> values);
     static void destroy(const ArrayObject* object) noexcept;
 
@@ -193,7 +193,7 @@ struct DictionaryEntry {
 // What a dictionary shares: a shape, and values right behind the object, in one allocation.
 class DictionaryObject : public ReferenceCounted {
 public:
-    // Moves the values, as many as the shape has keys; null pointer when there are none.
+    // Moves the values, as many as the shape has keys; null without values.
     static const DictionaryObject* create(Reference<DictionaryShape> shape, std::span<Value> values);
     static void destroy(const DictionaryObject* object) noexcept;
 
@@ -258,7 +258,7 @@ public:
     [[nodiscard]] Iterator begin() const noexcept;
     [[nodiscard]] Iterator end() const noexcept;
 
-    // The value under the key, or null pointer. Valid as long as a copy of this dictionary lives.
+    // The value of the key, or null. Valid as long as a copy of this dictionary exists.
     [[nodiscard]] const Value* find(std::string_view key) const noexcept;
     [[nodiscard]] bool contains(std::string_view key) const noexcept { return find(key) != nullptr; }
 
