@@ -56,7 +56,7 @@ int main(void)
     kesto_channel_enter(mixer.state, RUNNING);
     for (int64_t cycle = 0; cycle < 100; ++cycle)
         finishCycle(&mixer, cycle * 20);
-    status = kesto_publisher_flush(publisher); // a real helper leaves that to the publisher's thread
+    status = kesto_publisher_flush(publisher); // a real helper leaves this to the publisher's thread
 
     puts(status == KESTO_OK ? "published; press return to take it away" : kesto_error_text(status));
     fflush(stdout);

@@ -55,7 +55,7 @@ int main()
         mixer.enter(Mixer::Running);
         for (std::int64_t cycle = 0; cycle < 100; ++cycle)
             mixer.finishCycle(cycle * 20);
-        status = publisher.flush(); // a real helper leaves that to the publisher's thread
+        status = publisher.flush(); // a real helper leaves this to the publisher's thread
     }
     if (status != kesto::Status::Ok) {
         std::cerr << "driver: " << kesto::errorText(status) << '\n';

@@ -10,7 +10,7 @@
 #include <threads.h>
 #include <time.h>
 
-enum { REPORTER = 4711 }; // a real player takes a random number: it is unique in the whole system
+enum { REPORTER = 4711 }; // a real player takes a random number, which is unique in the whole system
 
 // Called on the client's thread.
 static void stateChanged(void* user, const kesto_state_change* change)

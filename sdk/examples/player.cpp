@@ -1,4 +1,4 @@
-// A tiny player that reports what it plays, and goes on reporting when the service was restarted meanwhile.
+// A tiny player that reports what it plays, and goes on reporting after a restart of the service.
 //
 //     c++ -std=c++17 player.cpp $(pkg-config --cflags --libs kesto) -o player && ./player
 //
@@ -46,8 +46,8 @@ public:
     }
 
 private:
-    // On the client's thread. Every connection begins without sessions; calls that are made here go before messages
-    // that were sent while the connection was being made.
+    // On the client's thread. Every connection begins without sessions. Calls that are made here go before messages
+    // that were sent while the client was connecting.
     void stateChanged(const kesto::StateChange& change)
     {
         if (change.state == kesto::State::Disconnected)

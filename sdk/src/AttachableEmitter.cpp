@@ -45,7 +45,7 @@ bool isPage(const FileDescriptor& file) noexcept
 
 constexpr int emptyPage = MAP_PRIVATE | MAP_ANONYMOUS;
 
-// Maps a page for reading; with MAP_FIXED it takes the place of the one that is there.
+// Maps a page for reading; with MAP_FIXED it replaces the page at that address.
 void* mapPage(void* place, int flags, int file) noexcept
 {
     AnnotateIgnoreWritesBegin(__FILE__, __LINE__);

@@ -1,8 +1,8 @@
-// How any number of callers wake one thread, without a system call while it is awake.
+// Lets any number of callers wake one thread, without a system call while it is awake.
 //
-// The thread says in `isAsleep_` that it is going to sleep until it is woken, and only then looks whether there is
-// something to do; callers first leave what they have for it and then look at the flag. Both are sequentially
-// consistent, so one of them sees the other. The first caller that sees the flag takes it back and rings.
+// The thread sets `isAsleep_` before it sleeps, and then checks once more for work. Callers first leave their work and
+// then read the flag. Both are sequentially consistent, so either the thread sees the work or the caller sees the flag.
+// The first caller that sees the flag clears it and rings.
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -16,7 +16,7 @@ namespace libkesto {
 
 class Doorbell {
 public:
-    // What it rings with; none, with `errno`, when the system has no descriptor.
+    // The descriptor with which it rings; none, with `errno`, if the system refuses it.
     [[nodiscard]] static platform::FileDescriptor makeDescriptor() noexcept
     {
         return platform::FileDescriptor(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
@@ -32,13 +32,13 @@ public:
     // Any thread.
     void ring() noexcept
     {
-        eventfd_write(descriptor_.get(), 1); // fails only when it has been rung 2^64 times and not been heard
+        eventfd_write(descriptor_.get(), 1); // fails only after 2^64 rings without a reading
     }
 
-    // The thread that is woken, as what follows: from now on callers ring.
+    // The following functions are for the thread that is woken. From now on callers ring.
     void fallAsleep() noexcept { isAsleep_.store(true); }
     void stayAwake() noexcept { isAsleep_.store(false); }
-    // After waiting, in any case.
+    // Call it after every wait.
     void wakeUp(bool hasRung) noexcept
     {
         stayAwake();
@@ -46,7 +46,7 @@ public:
         if (hasRung)
             eventfd_read(descriptor_.get(), &rings);
     }
-    // Sleeps so long (-1: for ever), or until it rings.
+    // Sleeps for this time (-1: for ever), or until it rings.
     void wait(int milliseconds) noexcept
     {
         pollfd watched{descriptor_.get(), POLLIN, 0};

@@ -50,9 +50,9 @@ typedef struct kesto_publisher_options {
     // The least time between two files of one channel. The thread makes it longer if writing would take more than a
     // twentieth of its time. 0: 500 ms.
     uint32_t write_interval_ms;
-    // The time in a state grows without a call, so its file is written again after this time. This is the only reason
-    // for which the thread wakes by itself. 0: 1 s. UINT32_MAX: never; the file is then exact when a state is entered
-    // and after `kesto_publisher_flush`.
+    // The time in a state grows without a call, so its file is written again after this time. The thread wakes without
+    // a call for this reason only. 0: 1 s. UINT32_MAX: never; the file is then exact when a state is entered and after
+    // `kesto_publisher_flush`.
     uint32_t refresh_interval_ms;
 } kesto_publisher_options;
 
@@ -93,7 +93,7 @@ typedef struct kesto_channel kesto_channel;
 // The greatest length of a state's name and of a unit, in bytes.
 #define KESTO_LONGEST_STATE_NAME 64
 
-// The name of a channel. `group` and `subgroup` may be null: then it has none.
+// The name of a channel. A null `group` or `subgroup` means that it has none.
 //
 // Names are UTF-8 of 1 to 255 bytes, and become names of folders and files: "/", control characters and a dot at the
 // beginning become "_", and a group cannot have the name "-". The part of the driver's name from a "<" on distinguishes
@@ -111,7 +111,7 @@ typedef struct kesto_channel_name {
 // buckets or states), KESTO_OUT_OF_MEMORY, or KESTO_SYSTEM_ERROR (with `errno`) if the file cannot be written: EPERM
 // means that a folder of this name belongs to another user.
 
-// A number, 0 at first. The service reports by how much it has grown; if it decreases, it counts as begun anew.
+// A number, 0 at first. The service reports by how much it has grown; if it decreases, it counts as a new channel.
 KESTO_API kesto_status kesto_channel_create_simple(kesto_publisher* publisher, const kesto_channel_name* name,
                                                    kesto_channel** channel);
 

@@ -46,8 +46,8 @@ public:
     }
     ~Publisher() { kesto_publisher_free(publisher_); }
 
-    // Frees the publisher that was open before, whose channels must be destroyed already. InvalidArgument, OutOfMemory
-    // or SystemError on failure.
+    // Frees the publisher that was open before; its channels must be destroyed already. InvalidArgument, OutOfMemory or
+    // SystemError on failure.
     [[nodiscard]] Status open(const PublisherOptions& options = PublisherOptions()) noexcept
     {
         kesto_publisher_options given{};

@@ -308,7 +308,7 @@ typedef struct kesto_options {
     // connection the first pause counts again. 0: 100 ms and 10 s.
     uint32_t first_retry_ms;
     uint32_t longest_retry_ms;
-    // May be null. `state_user` is released after the last call, or at once if the client cannot be opened.
+    // May be null. `state_user` is released after the last call, or immediately if the client cannot be opened.
     kesto_state_callback state_changed;
     void* state_user;
     kesto_release_callback state_release;
@@ -316,10 +316,10 @@ typedef struct kesto_options {
     bool trace;
 } kesto_options;
 
-// Makes a client, whose thread starts connecting at once; calls are possible at once and wait for the connection. Does
-// not block. `*client` is set before the first callback, which may use it. Null options: the defaults. On failure
-// `*client` is null: KESTO_INVALID_ARGUMENT (a service name with a slash, a path longer than a socket's address),
-// KESTO_OUT_OF_MEMORY or KESTO_SYSTEM_ERROR (with `errno`).
+// Makes a client and starts its thread, which begins to connect. Calls are possible immediately and wait for the
+// connection. Does not block. `*client` is set before the first callback, which may use it. Null options: the defaults.
+// On failure `*client` is null: KESTO_INVALID_ARGUMENT (a service name with a slash, a path longer than a socket's
+// address), KESTO_OUT_OF_MEMORY or KESTO_SYSTEM_ERROR (with `errno`).
 KESTO_API kesto_status kesto_client_open(const kesto_options* options, kesto_client** client);
 
 // Refuses further calls, waits up to `timeout_ms` until the taken calls are sent and answered (except starts of
@@ -368,24 +368,25 @@ KESTO_API kesto_status kesto_client_set_service_type(kesto_client* client, kesto
 KESTO_API kesto_status kesto_client_get_service_type(kesto_client* client, kesto_reporter reporter,
                                                      kesto_answer_callback callback, void* user,
                                                      kesto_release_callback release);
-// Merges the entries into the session's configuration. "HostApplicationDisplayID" is the application on whose
-// behalf it plays. The message may be reused at once. Answered with success.
+// Merges the entries into the session's configuration. "HostApplicationDisplayID" names the application for which the
+// session plays. The caller may reuse the message as soon as this returns. Answered with success.
 KESTO_API kesto_status kesto_client_set_configuration(kesto_client* client, const kesto_message* configuration,
                                                       kesto_reporter reporter, kesto_answer_callback callback,
                                                       void* user, kesto_release_callback release);
-// Begins a run. Answered with success when the run ends; at once if the session does not exist or has started already.
+// Begins a run. Answered with success when the run ends, or immediately if the session does not exist or has started
+// already.
 KESTO_API kesto_status kesto_client_start_session(kesto_client* client, kesto_reporter reporter,
                                                   kesto_answer_callback callback, void* user,
                                                   kesto_release_callback release);
 
 // Sends a message to the sessions of these reporters, of any client; a null list means all started sessions, an empty
-// one none. The message may be reused at once. Answered without a result.
+// one none. The caller may reuse the message as soon as this returns. Answered without a result.
 //
-// For real-time threads: no lock, no allocation, no wait, and no system call as long as a session that this client
-// started has not been stopped, destroyed or created anew, or lost with its connection (counted from the return of
-// start to the call of stop, destroy or create). When no session is started and the client's thread sleeps, the first
-// send wakes it with one write to an event descriptor, and further sends make no system call until all are answered and
-// the thread sleeps again. `wake_on_send` changes that.
+// For real-time threads: no lock, no allocation, no wait. It also makes no system call while a session of this client
+// is started. The session counts as started from the return of start until stop, destroy or another create is called or
+// the connection is lost. When no session is started and the client's thread sleeps, the first send wakes it with one
+// write to an event descriptor; further sends make no system call until all are answered and the thread sleeps again.
+// `wake_on_send` changes that.
 //
 // A message that is not taken is counted by reason: KESTO_QUEUE_FULL, KESTO_NOT_CONNECTED (and KESTO_CLOSED), or
 // KESTO_TOO_LARGE and any other failure of the message.
@@ -433,7 +434,7 @@ typedef struct kesto_statistics {
     uint64_t unexpected_answers; // to calls that expect none
 } kesto_statistics;
 
-// Fills `statistics`, whose size the caller gives as sizeof(kesto_statistics). Each count is current; together they are
+// Fills `statistics`; the caller gives its size as sizeof(kesto_statistics). Each count is current; together they are
 // exact only while no message is on its way. Never waits: any thread, real-time threads too.
 KESTO_API void kesto_client_statistics(const kesto_client* client, kesto_statistics* statistics, size_t size);
 

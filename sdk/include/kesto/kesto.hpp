@@ -175,8 +175,9 @@ struct IsRange<T, std::void_t<decltype(std::declval<const T&>().begin()), declty
 // A dictionary of keys and values, encoded while it is built; a message or a configuration. One thread at a time.
 //
 // A failure (text that is not UTF-8, too large, too deep, a forgotten `end`, no memory) stays until `clear`: `status`
-// and sending the message return it. A message that is cleared instead of made anew does not allocate after it has held
-// its largest content once. A message that was moved from can only be assigned to or destroyed.
+// and sending the message return it. If a program keeps and clears a message instead of making a new one, the message
+// does not allocate after it has held its largest content once. A message that was moved from can only be assigned to
+// or destroyed.
 class Message {
 public:
     Message() noexcept : message_(kesto_message_create()) { }
@@ -253,7 +254,7 @@ public:
         return *this;
     }
 
-    // Makes room for so many encoded bytes: about 10 + key + value an entry.
+    // Makes room for so many encoded bytes; an entry takes about 10 bytes and its key and value.
     Status reserve(std::size_t bytes) noexcept { return Status(kesto_message_reserve(get(), bytes)); }
 
     // The first failure, or Misnested while an array or a dictionary has not ended, or Ok.
@@ -402,7 +403,7 @@ public:
     }
     ~Client() { kesto_client_free(client_); }
 
-    // Starts connecting, without waiting; calls are possible at once. A client that was open before is closed.
+    // Starts connecting, without waiting; calls are possible immediately. Closes a client that was open before.
     // InvalidArgument, OutOfMemory or SystemError on failure.
     [[nodiscard]] Status open(const Options& options = Options())
     {
@@ -466,7 +467,7 @@ public:
     {
         return call(std::move(callback), kesto_client_get_service_type, reporter);
     }
-    // "HostApplicationDisplayID" is the application on whose behalf the session plays.
+    // "HostApplicationDisplayID" names the application for which the session plays.
     Status setConfiguration(const Message& configuration, ReporterID reporter, AnswerCallback callback = nullptr)
     {
         return call(std::move(callback), kesto_client_set_configuration, configuration.get(), reporter);

@@ -44,7 +44,7 @@ KESTO_API const kesto_tracer* kesto_client_tracer(const kesto_client* client);
 KESTO_API void kesto_tracer_emit(const kesto_tracer* tracer, uint32_t code, uint64_t argument1, uint64_t argument2,
                                  uint64_t argument3, uint64_t argument4);
 
-// Whether a trace runs at this moment; check it before computing expensive arguments. Any thread.
+// Whether a trace runs now; check it before computing expensive arguments. Any thread.
 static inline bool kesto_trace_active(const kesto_tracer* tracer)
 {
     return __builtin_expect(__atomic_load_n(tracer->is_tracing, __ATOMIC_RELAXED) != 0, 0);

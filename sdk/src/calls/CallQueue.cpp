@@ -1,5 +1,5 @@
-// Room is claimed at one end and given back at the other, both as numbers that only grow; where a record would cross
-// the end of the ring, a filler takes its place.
+// Callers claim room at one end, and the reader frees it at the other; both positions are numbers that only grow. Where
+// a record would cross the end of the ring, a filler takes its place.
 #include "calls/CallQueue.h"
 
 #include <bit>
@@ -44,8 +44,8 @@ bool CallQueue::push(std::initializer_list<std::string_view> parts, std::size_t 
         const std::uint64_t read = read_.load(std::memory_order_acquire);
         const std::size_t toTheEnd = capacity_ - offset(position);
         filling = needed > toTheEnd ? toTheEnd : 0; // a record lies in one piece
-        // Other callers may have moved `write_` on, and the reader may even have passed `position` since it was
-        // read: the exchange then fails and tells the new one.
+        // Meanwhile other callers may have advanced `write_`, and the reader may even have passed `position`: the
+        // exchange then fails and returns the new position.
         if (read <= position && position - read + filling + needed + keepFree > capacity_)
             return false;
     } while (!write_.compare_exchange_weak(position, position + filling + needed));
@@ -85,7 +85,7 @@ void CallQueue::release(std::size_t size) noexcept
 {
     const std::uint64_t position = read_.load(std::memory_order_relaxed);
     std::memset(bytesAt(position), 0, size);
-    read_.store(position + size); // hands the zeros over to whoever claims the room next
+    read_.store(position + size); // hands the zeros to the caller that claims the room next
 }
 
 } // namespace libkesto

@@ -1,11 +1,11 @@
-// The road from any number of calling threads to the one thread of a client: a bounded ring of bytes.
+// The queue from any number of calling threads to the one thread of a client: a bounded ring of bytes.
 //
-// Made for callers that must not wait. Pushing is one compare-and-swap that claims room, a copy, and one store that
-// hands the record over: no lock, no allocation, no system call. A caller that loses the race for the room tries
-// again at once, and it can only lose to one that got through. A record that does not fit is refused.
+// It is made for callers that must not wait. Pushing is one compare-and-swap that claims room, a copy, and one store
+// that hands the record over: no lock, no allocation, no system call. A caller that loses the race for the room tries
+// again immediately; it loses only to a caller that succeeds. A record that does not fit is refused.
 //
-// A caller that is suspended between claiming and handing over holds back what was pushed after it, but no other
-// caller. Room that was read is zeroed before it is given back: a record's head that is not zero is there to be read.
+// If a caller is suspended between claiming and handing over, the reader cannot pass its record, but other callers go
+// on. The reader zeroes the room before it frees it; so a record with a head other than zero is complete.
 #pragma once
 
 #include <atomic>
@@ -23,24 +23,24 @@ public:
     // `capacity` is a power of two. The memory is touched here, so that no caller meets a page fault.
     explicit CallQueue(std::size_t capacity);
 
-    // Copies the parts, one behind the other, as one record, unless that left less than `keepFree` bytes free. Any
+    // Copies the parts, one behind the other, as one record, unless less than `keepFree` bytes would then be free. Any
     // thread.
     [[nodiscard]] bool push(std::initializer_list<std::string_view> parts, std::size_t keepFree = 0) noexcept;
 
-    // The oldest record, aligned to 8 bytes, until `popFront`; nothing while there is none to be read yet. The
-    // reading thread.
+    // The oldest record, aligned to 8 bytes and valid until `popFront`; nothing if none is complete. The reading
+    // thread.
     [[nodiscard]] std::optional<std::string_view> front() noexcept;
     void popFront() noexcept;
 
-    // Positions only grow: a record has been popped when `readPosition` has reached the `writePosition` that was seen
-    // after it was pushed. Sequentially consistent with what callers do next to pushing. Any thread.
+    // Positions only grow. A record has been popped when `readPosition` has reached the `writePosition` read after its
+    // push. Both are sequentially consistent with what callers do after a push. Any thread.
     [[nodiscard]] std::uint64_t writePosition() const noexcept { return write_.load(); }
     [[nodiscard]] std::uint64_t readPosition() const noexcept { return read_.load(); }
-    // Whether nobody has claimed room that was not read yet.
+    // Whether the reader has read all the room that callers claimed.
     [[nodiscard]] bool isEmpty() const noexcept { return writePosition() == readPosition(); }
 
 private:
-    // A record's head: the size of its content, and whether it is there, or only fills the ring up to its end.
+    // A record's head holds the size of its content and a mark: a record, or a filler up to the end of the ring.
     enum Mark : std::uint64_t { None = 0, Record = 1, Filling = 2, Mask = 3 };
     static constexpr unsigned sizeShift = 2;
     static constexpr std::size_t wordSize = sizeof(std::uint64_t);

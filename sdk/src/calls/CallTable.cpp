@@ -1,4 +1,5 @@
-// What is said of a call goes by what a session's state allows: the table follows it as the service does.
+// The answers that a start can still get depend on its session's state, so the table follows that state like the
+// service.
 #include "calls/CallTable.h"
 
 #include <string>
@@ -16,7 +17,7 @@ kesto_answer answerTo(std::uint64_t number, kesto_operation operation, kesto_rep
     return answer;
 }
 
-// Whether the service answers it after everything it had to say about earlier starts of the same reporter.
+// Whether the service answers the operation only after all its answers to earlier starts of the same reporter.
 bool endsEarlierStarts(kesto_operation operation) noexcept
 {
     return operation == KESTO_OPERATION_STOP_SESSION || operation == KESTO_OPERATION_DESTROY_SESSION
@@ -47,7 +48,7 @@ void CallTable::add(std::uint64_t number, const CallHead& head)
     const bool isStart = head.operation == KESTO_OPERATION_START_SESSION;
     if (isStart)
         startsByReporter_.emplace(head.reporter, number);
-    (isStart ? starts_ : calls_).try_emplace(number, head); // last: it takes the callback over and cannot fail then
+    (isStart ? starts_ : calls_).try_emplace(number, head); // last: it takes over the callback and cannot fail then
 }
 
 bool CallTable::answer(const AnswerFrame& frame)
@@ -93,7 +94,7 @@ bool CallTable::deliver(const AnswerFrame& frame, const PendingCall& call)
     return true;
 }
 
-// A start stays for a second answer. Only the oldest of a reporter can get one: those after it found it started.
+// A start stays for a second answer. Only a reporter's oldest start can get one, because later ones found it started.
 void CallTable::deliverToStart(Calls::iterator start)
 {
     start->second.answersLeft = 0;

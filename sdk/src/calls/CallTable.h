@@ -1,8 +1,8 @@
-// The calls that wait for answers, and what is known about how many answers each will get.
+// The calls that wait for answers, and how many answers each can still get.
 //
-// Nearly all calls get one. Asking for the service type of reporter 0 gets two. A start is answered when its run
-// ends, a second time if a trace ran, and never when its session is destroyed or replaced; but whatever the service
-// had to say about it has been said when a later stop, destroy or create of that reporter is answered.
+// Nearly all calls get one answer. Asking for the service type of reporter 0 gets two. A start is answered when its run
+// ends, a second time if a trace ran, and never if its session is destroyed or replaced. But when a later stop, destroy
+// or create of the same reporter is answered, no further answer to the start can come.
 #pragma once
 
 #include "Callback.h"
@@ -17,28 +17,28 @@
 
 namespace libkesto {
 
-// Answers a call with an error of the library's own. For calls that never reached a table, too.
+// Answers a call with an error of the library, even if the call never reached a table.
 void answerWithError(std::uint64_t number, kesto_operation operation, kesto_reporter reporter, const Callback& callback,
                      kesto_status status);
 
-// The client's thread. Callbacks are called from here.
+// The client's thread, which also calls the callbacks here.
 class CallTable {
 public:
-    // Starts that were answered and may be answered again. Who has more of them gets no second answers.
+    // The limit of starts that were answered and may be answered again. Beyond it a start gets no second answer.
     static constexpr std::size_t mostAnsweredStarts = 16 * 1024;
 
     explicit CallTable(Counters& counters) noexcept : counters_(counters) { }
 
-    // Takes over the callback, unless it throws.
+    // Takes over the callback unless it throws.
     void add(std::uint64_t number, const CallHead& head);
 
-    // Hands an answer to the call that it is for. False when no service answers such a call like that.
+    // Gives the answer to its call. False if no service answers such a call like this.
     [[nodiscard]] bool answer(const AnswerFrame& frame);
 
-    // Answers what is unanswered with an error, and forgets everything.
+    // Answers all waiting calls with the error, and forgets them.
     void endAll(kesto_status status);
 
-    // Starts aside, which may stay unanswered for days.
+    // Without starts, which may stay unanswered for days.
     [[nodiscard]] std::size_t unanswered() const noexcept { return calls_.size(); }
     [[nodiscard]] bool isAnsweredUpTo(std::uint64_t number) const noexcept
     {
@@ -51,7 +51,7 @@ private:
 
         kesto_operation operation;
         kesto_reporter reporter;
-        unsigned answersLeft; // of starts: how many they must get
+        unsigned answersLeft; // of starts: the number that they must get
         Callback callback;
     };
     using Calls = std::map<std::uint64_t, PendingCall>;

@@ -1,4 +1,4 @@
-// What is checked before a message is taken, and in which order things go when a client goes.
+// The checks before a message is taken, and the order in which a client ends.
 #include "calls/Client.h"
 
 #include "SignalFreeThread.h"
@@ -53,7 +53,7 @@ void kesto_client::run() noexcept
 void kesto_client::free(std::unique_ptr<kesto_client> client) noexcept
 {
     if (client->process_ != ::getpid()) {
-        // The parent's thread is not here, and what it was doing is not known: nothing can be taken apart.
+        // The parent's thread does not exist here, and its work may be half done: nothing can be destroyed safely.
         static_cast<void>(client.release());
         return;
     }
@@ -117,7 +117,7 @@ kesto_status kesto_client::setConfiguration(const libkesto::MessageEncoder& conf
     return status;
 }
 
-// In the queue, and in a frame that the service takes.
+// Whether the message fits in the queue, and in a frame that the service accepts.
 bool kesto_client::fits(std::size_t entryBytes, std::size_t reporterCount) const noexcept
 {
     const std::size_t most = std::min(mailbox_.largestRecord(), platform::longestFrame);

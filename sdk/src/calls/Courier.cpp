@@ -1,4 +1,4 @@
-// One loop: answers first, then what callers gave, then sleep.
+// One loop: it takes the callers' calls, sends them, sleeps, and hands out the answers.
 #include "calls/Courier.h"
 
 #include <algorithm>
@@ -11,8 +11,8 @@
 namespace libkesto {
 namespace {
 
-constexpr Courier::Milliseconds forever{-1}; // as poll has it
-constexpr std::uint64_t traceRequest = 0; // its number; those of calls begin with 1
+constexpr Courier::Milliseconds forever{-1}; // as in poll
+constexpr std::uint64_t traceRequest = 0; // the number of this request; numbers of calls begin with 1
 
 } // namespace
 
@@ -43,7 +43,7 @@ void Courier::run() noexcept
     while (!isStopping_.load()) {
         try {
             step();
-        } catch (const std::bad_alloc&) { // the call at fault is still in the mailbox, or known to be unanswered
+        } catch (const std::bad_alloc&) { // the call at fault is still in the mailbox, or in the table
             disconnect({KESTO_OUT_OF_MEMORY});
         }
     }
@@ -79,7 +79,7 @@ void Courier::close() noexcept
 {
     connection_.close();
     if (settings_.emitter)
-        settings_.emitter->detach(); // whatever a service said that is gone
+        settings_.emitter->detach(); // the descriptors came from a service that is gone
 }
 
 void Courier::disconnect(ConnectionFailure failure)
@@ -90,7 +90,7 @@ void Courier::disconnect(ConnectionFailure failure)
         retryAt_ = Clock::now() + retryPause_;
         retryPause_ = std::min(retryPause_ * 2, settings_.longestRetry);
     }
-    state_.store(KESTO_STATE_DISCONNECTED); // from here on calls are refused
+    state_.store(KESTO_STATE_DISCONNECTED); // from now on calls are refused
     startedReporters_.clear();
     calls_.endAll(KESTO_CONNECTION_LOST);
     loseWaitingCalls(KESTO_CONNECTION_LOST);
@@ -100,7 +100,7 @@ void Courier::disconnect(ConnectionFailure failure)
 
 void Courier::pauseBeforeRetry()
 {
-    loseWaitingCalls(KESTO_CONNECTION_LOST); // what was given in the moment of the change
+    loseWaitingCalls(KESTO_CONNECTION_LOST); // calls that were made during the change
     flushes_.endAll(KESTO_NOT_CONNECTED);
     static_cast<void>(wait());
     if (retryAt_ && Clock::now() >= *retryAt_)
@@ -111,7 +111,7 @@ void Courier::exchange()
 {
     takeCalls();
     if (const auto sent = connection_.send(); !sent) {
-        while (receive().value_or(0) > 0) { } // what was answered before the service went
+        while (receive().value_or(0) > 0) { } // answers that the service sent before it went
         return disconnect(sent.error());
     }
     flushes_.serve(mailbox_.readPosition(), lastCall_, calls_);
@@ -134,7 +134,7 @@ bool Courier::take(const AnswerFrame& answer)
     if (answer.call != traceRequest || !settings_.emitter)
         return calls_.answer(answer);
     ReceivedDescriptors descriptors = connection_.takeDescriptors();
-    return !descriptors[0] || settings_.emitter->attach(std::move(descriptors)); // without any, nobody is to trace
+    return !descriptors[0] || settings_.emitter->attach(std::move(descriptors)); // without them, it may not trace
 }
 
 bool Courier::canTakeCalls() const noexcept
@@ -142,7 +142,7 @@ bool Courier::canTakeCalls() const noexcept
     return connection_.unsentBytes() < mostUnsentBytes && calls_.unanswered() < settings_.unansweredLimit;
 }
 
-// A call leaves the mailbox only when it is known to the table: whatever fails in between, it is answered once.
+// A call leaves the mailbox only when the table has it: whatever fails in between, the call is answered exactly once.
 void Courier::takeCalls()
 {
     while (canTakeCalls()) {
@@ -217,16 +217,16 @@ bool Courier::looksByItself() const noexcept
     return !settings_.wakeOnSend && (!startedReporters_.empty() || calls_.unanswered() > 0);
 }
 
-// How long to wait for the socket and the doorbell. Says so to the callers when messages are to ring.
+// How long to wait for the socket and the doorbell. If messages have to ring, it first makes callers do so.
 Courier::Milliseconds Courier::longestWait() noexcept
 {
     if (!canTakeCalls())
-        return forever; // the service has to do something first, and the socket tells when it has
+        return forever; // the service must act first, and then the socket wakes the thread
     if (nextRecord())
         return Milliseconds(0);
     if (looksByItself())
         return pause_;
-    // What is still being put in does not ring any more, but will be there in a moment.
+    // A call that is just being put in does not ring any more, but will be there in a moment.
     Milliseconds wait = mailbox_.fallAsleep() ? forever : shortestPause;
     if (retryAt_ && state_.load() == KESTO_STATE_DISCONNECTED) {
         const auto untilRetry = std::chrono::ceil<Milliseconds>(*retryAt_ - Clock::now());
@@ -235,7 +235,7 @@ Courier::Milliseconds Courier::longestWait() noexcept
     return wait;
 }
 
-// Waits until there is something to do. True when the socket has something to read.
+// Waits until there is something to do. True if the socket has something to read.
 bool Courier::wait()
 {
     const short writing = connection_.unsentBytes() > 0 ? POLLOUT : 0;

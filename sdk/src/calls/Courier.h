@@ -1,8 +1,8 @@
-// The client's thread: takes calls from the mailbox, sends them, hands out the answers, and makes a new connection
-// when the old one is gone and the caller wants that.
+// The client's thread: takes calls from the mailbox, sends them, hands out the answers and, if the caller wants that,
+// connects again after a connection has ended.
 //
-// When a connection ends, everything that was taken and not answered is lost, and answered so, before anybody is told
-// of the change: whoever hears of it starts from nothing.
+// When a connection ends, all unanswered calls are lost. They get their error before the change of state is reported,
+// so that the state callback starts from nothing.
 #pragma once
 
 #include "ClientSettings.h"
@@ -28,17 +28,17 @@ public:
     using Clock = std::chrono::steady_clock;
     using Milliseconds = std::chrono::milliseconds;
 
-    // How often the thread looks into the mailbox while messages come, and when none have come for a while.
+    // How often the thread looks into the mailbox while messages come, and after a time without messages.
     static constexpr Milliseconds shortestPause{5};
     static constexpr Milliseconds longestPause{100};
-    // No further calls are taken while so much waits for the socket to take it.
+    // It takes no further calls while the socket has not accepted so many bytes.
     static constexpr std::size_t mostUnsentBytes = 64 * 1024;
 
     Courier(ClientSettings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters);
-    // Answers what callers put in after `run` had ended. The thread that frees the client.
+    // Answers the calls that were put in after `run` returned. The thread that frees the client.
     ~Courier();
 
-    // Returns after `stop`, when everything has been answered. The client's thread.
+    // Returns after `stop`, when every call has its answer. The client's thread.
     void run() noexcept;
     // Any thread.
     void stop() noexcept;
@@ -46,11 +46,10 @@ public:
     // Any thread.
     [[nodiscard]] const AttachableEmitter* emitter() const noexcept { return settings_.emitter.get(); }
 
-    // Whether the caller is being told of a change of state. What it gives then, on the client's thread, goes ahead of
-    // what waits in the mailbox: a message that was sent while the connection was made finds the sessions that are made
-    // with it.
+    // Whether the state callback is running. Its calls, on the client's thread, go ahead of those in the mailbox: a
+    // message that was sent while the client was connecting then finds the sessions that the callback creates.
     [[nodiscard]] bool isTellingState() const noexcept { return isTellingState_.load(std::memory_order_relaxed); }
-    // Takes over the callback and the configuration's entries when it answers KESTO_OK. The client's thread.
+    // Takes over the callback and the configuration's entries if it returns KESTO_OK. The client's thread.
     [[nodiscard]] kesto_status putFirst(const CallHead& head, std::string_view reporters,
                                         std::string_view entries) noexcept;
 
@@ -84,17 +83,17 @@ private:
     std::atomic<bool> isStopping_ = false;
     std::atomic<bool> isTellingState_ = false;
 
-    // The client's thread's.
+    // Only for the client's thread.
     ServiceConnection connection_;
-    std::deque<std::string> firstCalls_; // records that go ahead of the mailbox's
+    std::deque<std::string> firstCalls_; // go ahead of those in the mailbox
     std::size_t firstCallsBytes_ = 0;
     CallTable calls_;
     foundation::CborDecoder decoder_;
-    Call call_; // the one being taken; kept for its memory
+    Call call_; // the call being taken; a member, so that its memory is used again
     std::uint64_t lastCall_ = 0;
     std::set<kesto_reporter> startedReporters_;
     Milliseconds pause_ = shortestPause;
-    Milliseconds retryPause_; // before the next attempt but one
+    Milliseconds retryPause_; // the pause after the next failure
     std::optional<Clock::time_point> retryAt_;
 };
 

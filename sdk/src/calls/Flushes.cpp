@@ -1,4 +1,4 @@
-// Who flushes waits for a place in the queue to be read, and then for all calls up to there to be answered.
+// A flush waits until the queue has been read up to its position, and then until all calls up to there are answered.
 #include "calls/Flushes.h"
 
 #include "calls/CallTable.h"

@@ -1,4 +1,4 @@
-// Callers that wait until what they gave has been answered.
+// Callers that wait until their calls are answered.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -17,8 +17,8 @@ class Flushes {
 public:
     using Deadline = std::chrono::steady_clock::time_point;
 
-    // Waits until everything that stood before `position` in the queue has been taken and answered, or lost. `ring`
-    // tells the client's thread about it. May throw std::bad_alloc. Any thread but the client's.
+    // Waits until everything before `position` in the queue is taken and answered, or lost. `ring` wakes the client's
+    // thread for this. May throw std::bad_alloc. Any thread except the client's.
     template <typename Ring> kesto_status wait(std::uint64_t position, Deadline deadline, Ring ring)
     {
         const foundation::Lock lock(mutex_);
@@ -33,16 +33,17 @@ public:
         return flush.result.value_or(KESTO_TIMED_OUT);
     }
 
-    // The queue has been taken up to `readPosition`, its last call having the number `lastCall`. The client's thread.
+    // The thread has taken the queue up to `readPosition`, and the last call had the number `lastCall`. The client's
+    // thread.
     void serve(std::uint64_t readPosition, std::uint64_t lastCall, const CallTable& calls);
-    // Ends all that wait now, and all that will ever wait. The client's thread.
+    // `endAll` ends all flushes that wait now; `close` also ends all later ones. The client's thread.
     void endAll(kesto_status status);
     void close();
 
 private:
     struct Flush {
         std::uint64_t position;
-        std::optional<std::uint64_t> lastCall; // that has to be answered, once the position has been reached
+        std::optional<std::uint64_t> lastCall; // the call to be answered; set when the position has been reached
         std::optional<kesto_status> result;
     };
 

@@ -1,4 +1,4 @@
-// What is put first, and who rings then.
+// The order of claiming room and ringing.
 #include "calls/Mailbox.h"
 
 #include <utility>
@@ -30,7 +30,7 @@ bool Mailbox::putCall(const CallHead& head) noexcept
     const bool hasRoom = queue_.push({bytesOf(head)});
     if (!hasRoom && isStart)
         --startsUnderway_;
-    bell_.ring(); // without room too: for messages that counted on this start to ring
+    bell_.ring(); // even without room: messages may have relied on the ring of this start
     return hasRoom;
 }
 

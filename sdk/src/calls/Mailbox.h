@@ -1,12 +1,12 @@
-// The queue between callers and the client's thread, and how the thread is woken: the part that keeps the promise
-// that `send` makes no system call while a session is started.
+// The queue between callers and the client's thread, and how callers wake that thread. It keeps the promise that `send`
+// makes no system call while a session is started.
 //
-// Waking a thread is a system call. So a thread that expects messages looks into the queue by itself from time to
-// time, and only one that is going to sleep until it is woken has callers ring (`Doorbell`): they first claim room in
-// the queue and then look whether it sleeps.
+// Waking a thread is a system call. So while the thread expects messages, it polls the queue from time to time. Only a
+// thread that sleeps until it is woken makes callers ring (see `Doorbell`): they first claim room in the queue and then
+// check whether it sleeps.
 //
-// The one moment in between: a start was given, the thread has not taken it yet, and may be asleep or about to be. The
-// start rings in any case, so nobody who sends meanwhile needs to: `startsUnderway_` tells them.
+// One case is in between: a start is in the queue, and the thread has not taken it yet and may sleep. Every start
+// rings, so messages need not ring meanwhile; `startsUnderway_` shows this to their senders.
 #pragma once
 
 #include "Doorbell.h"
@@ -24,29 +24,29 @@ namespace libkesto {
 
 class Mailbox {
 public:
-    // `doorbell` is made by `Doorbell`.
+    // `Doorbell::makeDescriptor` makes `doorbell`.
     Mailbox(std::size_t bytes, platform::FileDescriptor doorbell);
 
-    // For messages: no system call unless the thread sleeps. False when there is no room. Any thread.
+    // For messages: no system call unless the thread sleeps. False if the queue has no room. Any thread.
     [[nodiscard]] bool putMessage(const CallHead& head, std::string_view reporters, std::string_view entries) noexcept;
-    // For all other calls, which find room when messages find none any more. Rings in any case. Any thread.
+    // For all other calls; room is kept for them that messages cannot use. Always rings. Any thread.
     [[nodiscard]] bool putCall(const CallHead& head) noexcept;
     // Any thread.
     void ring() noexcept { bell_.ring(); }
-    // Largest record that a message may be: smaller than what is ever free when the queue is empty.
+    // The size limit of a message's record: an empty queue always has more room than that.
     [[nodiscard]] std::size_t largestRecord() const noexcept { return bytes_ / 4; }
-    // Where the queue stands, to tell when everything that was put before has been taken. Any thread.
+    // The queue's positions, from which a caller learns when its calls have been taken. Any thread.
     [[nodiscard]] std::uint64_t writePosition() const noexcept { return queue_.writePosition(); }
     [[nodiscard]] std::uint64_t readPosition() const noexcept { return queue_.readPosition(); }
 
-    // The client's thread takes what was put, oldest first.
+    // For the client's thread: the oldest record.
     [[nodiscard]] std::optional<std::string_view> front() noexcept { return queue_.front(); }
     void popFront() noexcept;
 
-    // The client's thread says that it is going to wait for the doorbell and that messages are to ring it. False when
-    // something was put meanwhile, or is being put: it must not wait for long then.
+    // The client's thread calls this before it waits for the doorbell: from now on messages ring. False if a call has
+    // come, or is just being put in; the thread must then not wait for long.
     [[nodiscard]] bool fallAsleep() noexcept;
-    // After waiting, in any case.
+    // Call it after every wait.
     void wakeUp(bool hasRung) noexcept { bell_.wakeUp(hasRung); }
     [[nodiscard]] int doorbell() const noexcept { return bell_.descriptor(); }
 
@@ -54,7 +54,7 @@ private:
     const std::size_t bytes_;
     CallQueue queue_;
     Doorbell bell_;
-    std::atomic<std::uint32_t> startsUnderway_ = 0; // given and not taken from the queue yet
+    std::atomic<std::uint32_t> startsUnderway_ = 0; // in the queue, not taken yet
 };
 
 } // namespace libkesto

@@ -1,4 +1,4 @@
-// Changing a channel is lock-free. Making its text is not: one thread at a time makes it, from the values that it sees.
+// Changing a channel takes no lock. Only one thread at a time makes its text, from the values that it sees.
 #include "channels/Channel.h"
 
 #include "foundation/text/Format.h"
@@ -95,7 +95,7 @@ kesto_status StateChannelValue::enter(std::size_t state, Time now) noexcept
     do {
         if (before.state == state)
             return KESTO_OK;
-        // Concurrent threads may have read the clock in another order than they come here.
+        // Concurrent threads may have read the clock in a different order.
         next = {state, std::max<std::uint64_t>(before.since, moment)};
     } while (!present_.compare_exchange_weak(before, next));
     states_[before.state].microseconds.fetch_add(next.since - before.since);

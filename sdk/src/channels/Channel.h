@@ -1,7 +1,7 @@
 // The value of a channel, which any thread may change at any time, and the text of its file.
 //
 // Values are atomic and independent: threads never wait for each other. A reader may see a value that is a moment old,
-// but a count never goes back, because that would mean that the channel has begun anew.
+// but a count never decreases, because that would make it a new channel.
 #pragma once
 
 #include "Doorbell.h"

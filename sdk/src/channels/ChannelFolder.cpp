@@ -128,7 +128,7 @@ ChannelFolder::ChannelFolder(std::string root, ChannelPlace place, std::string t
 
 ChannelFolder::~ChannelFolder()
 {
-    const int error = errno; // which a failing caller may be about to return
+    const int error = errno; // the caller may be about to return it
     claim_.reset();
     removeIfEmpty(root_, place_);
     errno = error;

@@ -1,8 +1,8 @@
 // The owner of channels: writes their files, on a thread of its own and on request, and removes them.
 //
 // The thread sleeps until the first change, writes the changed channels, and rests: so a file is written at most once
-// in an interval, and a change after a quiet time is visible at once. It rests longer if writing takes too much of its
-// time, and if files cannot be written.
+// in an interval, and a change after a quiet time is visible immediately. It rests longer if writing takes too much of
+// its time, and if files cannot be written.
 #pragma once
 
 #include "Counters.h"
@@ -47,9 +47,9 @@ public:
 
     // Whether this process made it. In a forked child the thread, the lock and the files belong to the parent.
     [[nodiscard]] bool isOfThisProcess() const noexcept { return process_ == ::getpid(); }
-    // What channels tell their changes.
+    // Channels ring it when they change.
     [[nodiscard]] libkesto::Doorbell& bell() noexcept { return bell_; }
-    // Writes the channel's first file; null, and the status, when it cannot be. May throw std::bad_alloc.
+    // Writes the channel's first file. Null, with the status, if that fails. May throw std::bad_alloc.
     [[nodiscard]] std::expected<kesto_channel*, kesto_status> add(std::unique_ptr<kesto_channel> channel,
                                                                   libkesto::ChannelPlace place, std::string name);
     // Destroys the channel and removes its file.
@@ -77,9 +77,9 @@ private:
     int write(Published& published, Time now) noexcept KESTO_REQUIRES(lock_);
     [[nodiscard]] std::shared_ptr<libkesto::ChannelFolder> folder(libkesto::ChannelPlace place) KESTO_REQUIRES(lock_);
 
-    const pid_t process_; // the one that made it
+    const pid_t process_; // of the process that made it
     const Settings settings_;
-    const std::string owner_; // what it calls itself in its files
+    const std::string owner_; // its name for itself in its files
     libkesto::Doorbell bell_;
     libkesto::Counter filesWritten_;
     libkesto::Counter filesFailed_;

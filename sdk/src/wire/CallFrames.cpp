@@ -1,4 +1,4 @@
-// A call's shape is known, so its frame is written straight from what the caller gave, without values in between.
+// The shape of a call is known, so its frame is written directly from the caller's data, without values in between.
 #include "wire/CallFrames.h"
 
 #include "client/ServiceOperations.h"

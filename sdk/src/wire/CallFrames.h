@@ -1,4 +1,4 @@
-// What goes over the connection: calls as frames, and answers out of frames. No sockets here.
+// The content of the connection: calls become frames, and frames become answers. It uses no sockets.
 #pragma once
 
 #include "Callback.h"
@@ -13,27 +13,27 @@
 
 namespace libkesto {
 
-// A call as callers put it into the queue, in front of its reporters and its entries. Plain data.
+// A call as it stands in the queue, before its reporters and entries. Plain data.
 struct CallHead {
     kesto_operation operation;
     std::uint16_t type = 0; // of the event, or of the service
-    bool hasReporters = false; // rather than a null list
+    bool hasReporters = false; // false: a null list
     kesto_category category = 0;
     std::uint32_t entryCount = 0;
     std::uint32_t reporterCount = 0;
     kesto_reporter reporter = 0;
     RawCallback callback = {};
-    std::string* entries = nullptr; // those of a configuration, which need not fit in the queue; owned
+    std::string* entries = nullptr; // those of a configuration, which may be too large for the queue; owned
 };
 
-// A call with everything that belongs to it, valid as long as the bytes that it was read from.
+// A call with all its parts, valid as long as the bytes from which it was read.
 struct Call {
     CallHead head;
     std::vector<kesto_reporter> reporters;
     std::string_view entries;
 };
 
-// The parts of a record of the queue, and back.
+// The head as bytes of a record of the queue, and back.
 [[nodiscard]] inline std::string_view bytesOf(const CallHead& head) noexcept
 {
     return {reinterpret_cast<const char*>(&head), sizeof head};
@@ -41,7 +41,7 @@ struct Call {
 [[nodiscard]] CallHead readHead(std::string_view record) noexcept;
 void readCall(std::string_view record, Call& call);
 
-// The bytes that a frame takes at most beside its entries.
+// The most bytes that a frame takes besides its entries.
 [[nodiscard]] constexpr std::size_t frameOverhead(std::size_t reporterCount) noexcept
 {
     constexpr std::size_t longestHead = 9;
@@ -52,10 +52,10 @@ void readCall(std::string_view record, Call& call);
 // Appends the call as a frame.
 void appendCall(std::uint64_t number, const Call& call, std::string& out);
 
-// Appends a request for what it takes to emit trace events, as a frame.
+// Appends a request for the descriptors for trace events, as a frame.
 void appendTraceRequest(std::uint64_t number, std::string& out);
 
-// An answer as it came. What its values mean depends on what was asked.
+// An answer as it came. The meaning of its values depends on the call.
 struct AnswerFrame {
     std::uint64_t call = 0;
     std::optional<foundation::String> errorDomain;
@@ -63,11 +63,11 @@ struct AnswerFrame {
     foundation::Array frame; // the values are its elements from the third on
 };
 
-// Nothing when the frame is no answer.
+// Nothing if the frame is not an answer.
 [[nodiscard]] std::optional<AnswerFrame> readAnswer(std::string_view frame, foundation::CborDecoder& decoder);
 
-// Fills in the result that the values say. False when they are not what the operation answers. `reporters` is where
-// the answer's list of reporters then stands.
+// Fills in the operation's result. False if the values are not such a result. `reporters` holds the answer's list of
+// reporters.
 [[nodiscard]] bool readResult(const AnswerFrame& frame, kesto_answer& answer, std::vector<kesto_reporter>& reporters);
 
 } // namespace libkesto

@@ -1,4 +1,4 @@
-// Heads that are written before their number is known, and widened in the rare case that one byte is too few.
+// A head is written before its number is known, and widened in the rare case that one byte is too small.
 #include "wire/MessageEncoder.h"
 
 #include "foundation/cbor/Cbor.h"
@@ -11,7 +11,7 @@ namespace {
 
 constexpr std::size_t longestHead = 9;
 
-// Runs what may be refused memory.
+// Runs the function; KESTO_OUT_OF_MEMORY if memory is exhausted.
 template <typename Function> kesto_status withMemory(Function function) noexcept
 {
     try {
@@ -54,7 +54,7 @@ kesto_status MessageEncoder::status() const noexcept
     return depth_ > 0 || hasKey_ ? KESTO_MISNESTED : KESTO_OK;
 }
 
-// Writes `size` bytes and a head, if there is room for them and a failure has not come first.
+// Calls `write` for `size` bytes and a head, if there is room for them and no earlier failure.
 template <typename Write> kesto_status MessageEncoder::add(std::size_t size, Write write) noexcept
 {
     if (failure_ != KESTO_OK)
@@ -76,7 +76,7 @@ kesto_status MessageEncoder::addKey(std::string_view key) noexcept
     return add(key.size(), [&] { foundation::appendCborText(key, bytes_); });
 }
 
-// Makes what comes next the value of the key, or an element of the array.
+// Makes the next value that of the key, or an element of the array.
 bool MessageEncoder::takePlace() noexcept
 {
     Container& container = containers_[depth_];

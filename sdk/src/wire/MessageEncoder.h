@@ -1,7 +1,7 @@
-// Builds the entries of a message as CBOR while they are added, so that sending is a copy and nothing else.
+// Encodes the entries of a message as CBOR while they are added, so that sending them is only a copy.
 //
-// The head of a container says how much it holds, which is known only at its end: one byte stands in for it until
-// then, and is nearly always enough. What was added can therefore be handed on at any time without a second pass.
+// The head of a container holds the number of its entries, which is known only at its end. One byte stands in for it
+// until then, and is nearly always large enough. So the entries can be sent at any time without a second pass.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -30,12 +30,12 @@ public:
     kesto_status beginDictionary() noexcept { return begin(true); }
     kesto_status end() noexcept;
 
-    // Makes the encoder fail from outside, for what it cannot see: a null pointer in place of text.
+    // Sets a failure that the encoder cannot see itself, such as a null pointer in place of text.
     kesto_status fail(kesto_status status) noexcept;
 
-    // The first failure, or KESTO_MISNESTED while something has begun and not ended.
+    // The first failure, or KESTO_MISNESTED while a container has begun and not ended.
     [[nodiscard]] kesto_status status() const noexcept;
-    // The entries, without the head of the map that they make up, and their number.
+    // The entries, without the head of their map, and their number.
     [[nodiscard]] std::string_view entries() const noexcept { return bytes_; }
     [[nodiscard]] std::uint32_t entryCount() const noexcept { return containers_.front().count; }
 
@@ -43,7 +43,7 @@ private:
     struct Container {
         bool isDictionary = true;
         std::uint32_t count = 0;
-        std::size_t head = 0; // where its stand-in is
+        std::size_t head = 0; // the place of its stand-in
     };
 
     kesto_status begin(bool isDictionary) noexcept;
@@ -51,9 +51,9 @@ private:
     template <typename Write> kesto_status add(std::size_t size, Write write) noexcept;
 
     std::string bytes_;
-    std::array<Container, KESTO_DEEPEST_NESTING + 1> containers_; // the message itself first
+    std::array<Container, KESTO_DEEPEST_NESTING + 1> containers_; // the first is the message itself
     std::size_t depth_ = 0; // of the innermost container that has not ended
-    bool hasKey_ = false; // and waits for its value
+    bool hasKey_ = false; // a key waits for its value
     kesto_status failure_ = KESTO_OK;
 };
 

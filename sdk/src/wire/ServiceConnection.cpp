@@ -1,4 +1,4 @@
-// A socket that never blocks: what it does not take waits here.
+// The socket never blocks: bytes that it does not accept wait here.
 #include "wire/ServiceConnection.h"
 
 #include <algorithm>
@@ -11,7 +11,7 @@
 namespace libkesto {
 namespace {
 
-// For how long a service that accepts nobody may hold up connecting.
+// How long a service that accepts no connection may delay connecting.
 constexpr timeval longestConnecting{.tv_sec = 1, .tv_usec = 0};
 
 std::unexpected<ConnectionFailure> failure(kesto_status reason, int systemError = 0)
@@ -38,7 +38,7 @@ ServiceConnection::Result ServiceConnection::connect(const std::string& path)
     platform::FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
     sockaddr_un address{};
     address.sun_family = AF_UNIX;
-    std::memcpy(address.sun_path, path.data(), path.size()); // it fits: paths are checked when the client is opened
+    std::memcpy(address.sun_path, path.data(), path.size()); // it fits: opening a client checks the paths
     if (!socket
         || ::setsockopt(socket.get(), SOL_SOCKET, SO_SNDTIMEO, &longestConnecting, sizeof longestConnecting) != 0
         || ::connect(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0)
@@ -51,7 +51,7 @@ ServiceConnection::Result ServiceConnection::connect(const std::string& path)
 void ServiceConnection::close() noexcept
 {
     if (socket_) {
-        // The service takes it for a broken connection when answers are left unread.
+        // If answers are left unread, the service treats the connection as broken.
         ::shutdown(socket_.get(), SHUT_WR);
         while (::recv(socket_.get(), received_.data(), received_.size(), MSG_DONTWAIT) > 0) { }
     }
@@ -107,7 +107,7 @@ void ServiceConnection::countSentMessages()
     }
 }
 
-// Descriptors come ahead of the frame that they belong to, and go unnoticed where none are expected.
+// Descriptors come before their frame, and are ignored where none are expected.
 ssize_t ServiceConnection::receiveBytes()
 {
     if (!expectsDescriptors_)

@@ -1,4 +1,4 @@
-// The socket to the service: connecting, and frames in both directions, without ever waiting for the peer.
+// The socket to the service: it connects and carries frames in both directions, and never waits for the peer.
 #pragma once
 
 #include "AttachableEmitter.h"
@@ -20,7 +20,7 @@
 
 namespace libkesto {
 
-// Why there is no connection any more, with `errno` where the system said so.
+// Why the connection ended, with `errno` if the system gave the reason.
 struct ConnectionFailure {
     kesto_status reason;
     int systemError = 0;
@@ -30,31 +30,31 @@ struct ConnectionFailure {
 class ServiceConnection {
 public:
     using Result = std::expected<void, ConnectionFailure>;
-    // Called for each frame that came; false when it breaks the protocol.
+    // Called for each frame; false if the frame breaks the protocol.
     using FrameHandler = std::function<bool(std::string_view frame)>;
 
     explicit ServiceConnection(Counters& counters) noexcept : counters_(counters) { }
 
-    // Connects to the first of the paths at which somebody listens.
+    // Connects to the first of the paths at which a service listens.
     [[nodiscard]] Result open(const std::vector<std::string>& paths);
-    // What was not sent is dropped. The path stays.
+    // Drops the unsent bytes, and keeps the path.
     void close() noexcept;
 
     [[nodiscard]] int descriptor() const noexcept { return socket_.get(); }
-    // Of the connection, or the last one that was tried.
+    // The path of the connection, or of the last attempt.
     [[nodiscard]] const std::string& path() const noexcept { return path_; }
 
-    // Puts a call behind those to be sent.
+    // Puts a call behind those that wait to be sent.
     void append(std::uint64_t number, const Call& call);
-    // The same with a request for what it takes to emit trace events; the answer's descriptors are then to be taken.
+    // The same with a request for the descriptors for trace events; take them when the answer comes.
     void appendTraceRequest(std::uint64_t number);
-    // Those that came last; none of them may be open.
+    // The last descriptors that came; each may be empty.
     [[nodiscard]] ReceivedDescriptors takeDescriptors() noexcept { return std::exchange(descriptors_, {}); }
     [[nodiscard]] std::size_t unsentBytes() const noexcept { return outbox_.size() - sentBytes_; }
 
-    // Sends as much as the socket takes.
+    // Sends what the socket accepts.
     [[nodiscard]] Result send();
-    // Reads what has come, once: how many bytes. Fails when the service has gone and nothing is left.
+    // Reads once, and returns the number of bytes. Fails if the service has gone and nothing is left to read.
     [[nodiscard]] std::expected<std::size_t, ConnectionFailure> receive(const FrameHandler& handle);
 
 private:
@@ -67,8 +67,8 @@ private:
     std::string path_;
     std::string outbox_; // its first `sentBytes_` are sent
     std::size_t sentBytes_ = 0;
-    std::deque<std::uint64_t> messageEnds_; // of those in the outbox, as positions in the stream
-    std::uint64_t streamPosition_ = 0; // of the outbox's beginning
+    std::deque<std::uint64_t> messageEnds_; // of messages in the outbox, as positions in the stream
+    std::uint64_t streamPosition_ = 0; // of the beginning of the outbox
     platform::FrameReader reader_;
     std::array<char, 16 * 1024> received_;
     ReceivedDescriptors descriptors_;

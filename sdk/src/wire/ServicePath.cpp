@@ -1,4 +1,4 @@
-// The environment is asked first, then the places where the service is as packaged.
+// The environment comes first, then the usual places of the packaged service.
 #include "wire/ServicePath.h"
 
 #include "platform/linux/process/Environment.h"

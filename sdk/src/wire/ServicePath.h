@@ -9,7 +9,7 @@
 
 namespace libkesto {
 
-// The paths to try, in order. An empty `socketPath` or `serviceName` stands for the default. KESTO_INVALID_ARGUMENT for
+// The paths to try, in order. An empty `socketPath` or `serviceName` means the default. KESTO_INVALID_ARGUMENT for
 // names that no socket can have. Reads the environment.
 [[nodiscard]] std::expected<std::vector<std::string>, kesto_status> servicePaths(const std::string& socketPath,
                                                                                  const std::string& serviceName);
