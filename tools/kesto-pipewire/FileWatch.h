@@ -1,4 +1,4 @@
-// Waits without polling for a file to appear: so the program learns at once that a lost server's socket is back.
+// Waits without polling for a file to appear: so the program learns immediately that a lost server's socket is back.
 #pragma once
 
 #include "kesto-pipewire/Loop.h"

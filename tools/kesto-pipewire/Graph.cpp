@@ -98,8 +98,8 @@ void Graph::removeNode(ObjectID id, Moment when)
     if (node.isDevice)
         deviceListener_.deviceGone(node.serial);
 
-    // Links go before their nodes. A link that did not go must not connect the ID's next owner with this node's
-    // partners.
+    // Links usually go before their nodes. If a link stays, it must not connect the next object with this ID to the
+    // node's partners.
     std::set<ObjectID> partners;
     std::erase_if(links_, [&](const auto& entry) {
         const auto& link = entry.second;

@@ -1,8 +1,8 @@
 // The part of PipeWire's object graph that concerns sound: streams, their applications and links, and devices.
 //
-// The server reports objects one by one, under IDs that it uses again at once. The graph keeps just enough of them to
-// turn these reports into changes of streams and devices. It is plain data and does not depend on libpipewire, so that
-// tests can try every order of events without a server. All functions run on one thread.
+// The server reports objects one by one, under IDs that it soon uses again. The graph keeps just enough of them to turn
+// these reports into changes of streams and devices. It is plain data and does not depend on libpipewire, so that tests
+// can try every order of events without a server. All functions run on one thread.
 #pragma once
 
 #include "kesto-pipewire/Device.h"
@@ -46,7 +46,7 @@ public:
     {
     }
 
-    // The kind of node whose further events are needed.
+    // The kinds of nodes of which the graph needs further events.
     enum class Interest : std::uint8_t { None, Stream, Device };
     [[nodiscard]] Interest addNode(ObjectID node, const NodeAnnouncement& announcement);
     void addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Moment when);
@@ -68,7 +68,7 @@ public:
     // Ignored for nodes that are not devices.
     void setDeviceState(ObjectID node, DeviceState state, Moment when);
     // Reports its cycles to each device, and late cycles to the streams; a driver was late if one of its followers was.
-    // The report comes later than the cycle: an ID may belong to another node by now, whose cycles began later.
+    // The report comes later than the cycle. By then the ID may belong to another node, with cycles that began later.
     void noteCycle(const Cycle& cycle);
 
     [[nodiscard]] bool anyStreamRuns() const noexcept { return runningStreams_ > 0; }

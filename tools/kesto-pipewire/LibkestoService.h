@@ -1,7 +1,7 @@
 // The reporting service behind a connection: passes the reporter's calls to libkesto.
 //
-// libkesto connects again by itself but does not create sessions again. This class reports a new connection on the
-// loop's thread, so that the reporter can make its sessions anew.
+// libkesto connects again without help, but does not create sessions again. This class reports a new connection on the
+// loop's thread, so that the reporter can create its sessions again.
 #pragma once
 
 #include "kesto-pipewire/Diagnostics.h"
@@ -21,7 +21,7 @@ namespace kesto_pipewire {
 class LibkestoService : public ReportingService {
 public:
     struct Handlers {
-        std::function<void()> appeared; // a new connection, whose service has no sessions
+        std::function<void()> appeared; // the new connection has no sessions
         std::function<void()> lost;
     };
 

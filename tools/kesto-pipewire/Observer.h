@@ -1,7 +1,7 @@
 // Keeps a connection to PipeWire, across restarts of the server, and reports changes of its streams and devices.
 //
 // When the server goes, every stream goes with it, and the observer waits for the next server: the appearance of its
-// socket wakes the observer at once, and a timer with growing pauses covers a missed appearance.
+// socket wakes the observer immediately, and a timer with growing pauses covers a missed appearance.
 #pragma once
 
 #include "kesto-pipewire/Diagnostics.h"

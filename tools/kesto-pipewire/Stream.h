@@ -11,7 +11,7 @@
 
 namespace kesto_pipewire {
 
-// PipeWire's `object.serial`. Object IDs are used again at once, serials never while the server lives.
+// PipeWire's `object.serial`. Object IDs are soon used again, serials never while the server lives.
 using StreamSerial = std::uint64_t;
 
 enum class Direction : std::uint8_t { Output, Input };

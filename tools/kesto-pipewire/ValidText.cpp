@@ -1,4 +1,4 @@
-// Cut first: a character that the cut halved would not be one any more.
+// The text is cut first, so that a character which the cut halves becomes "?" as well.
 #include "kesto-pipewire/ValidText.h"
 
 #include "foundation/values/String.h"

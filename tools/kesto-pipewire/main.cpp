@@ -1,7 +1,7 @@
 // kesto-pipewire: reports every stream of a running PipeWire to the reporting service, so that players stay unchanged.
 //
 // This file connects the parts: the observer of PipeWire; the reporter, which decides what to report; the connection to
-// the service; and the channels, which the service reads by itself. The program runs until a signal ends it and then
+// the service; and the channels, which the service reads directly. The program runs until a signal ends it and then
 // ends every session. If one of the two servers goes, it waits until the server is back.
 
 #include "kesto-pipewire/DeviceChannels.h"

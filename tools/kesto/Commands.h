@@ -1,4 +1,4 @@
-// The subcommands of `kesto`, a file each. The chosen one runs after the command line was parsed and sets the exit
+// The subcommands of `kesto`, one in each file. The chosen one runs after the command line was parsed and sets the exit
 // status.
 #pragma once
 

@@ -1,4 +1,4 @@
-// One rule for all three directories; they differ in their names only.
+// One rule for all three directories: only their names differ.
 #include "kesto/ServiceDirectories.h"
 
 #include "platform/linux/process/Environment.h"
@@ -12,7 +12,8 @@ using platform::environment;
 
 namespace {
 
-// Of the user's directories the first counts that holds that file; an empty name stands for the directory itself.
+// The variable's directory; without it the first of the user's directories that holds the file (with an empty name,
+// that exists); else the system's.
 fs::path usualDirectory(const char* variable, std::initializer_list<fs::path> ofUser, const fs::path& ofSystem,
                         const fs::path& file = {})
 {

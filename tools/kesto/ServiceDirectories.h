@@ -1,5 +1,5 @@
-// The default directories of the service: those of the environment, in systemd's names, as for the service itself; else
-// the user's own directories, if the user has a service; else the system's.
+// The default directories of the service. The environment comes first, with systemd's names, as for the service itself;
+// then the user's own directories, if the user has a service; then the system's.
 #pragma once
 
 #include <filesystem>

@@ -12,7 +12,7 @@ namespace {
 
 constexpr std::size_t narrowest = 40;
 
-// Of a character in UTF-8.
+// The first byte of a character in UTF-8.
 bool isFirstByte(char byte)
 {
     return (static_cast<unsigned char>(byte) & 0xC0U) != 0x80U;
@@ -76,7 +76,7 @@ std::string shownText(const foundation::Value& value)
 {
     if (value.kind() != foundation::Value::Kind::Number)
         return value.text();
-    std::string text; // true, where `text` has 1
+    std::string text; // "true", where `text` has 1
     foundation::appendJsonText(value, text);
     return text;
 }

@@ -35,7 +35,7 @@ int main(int argumentCount, char** arguments)
             throw std::runtime_error("the output could not be written");
         return exitStatus;
     } catch (const CLI::ParseError& error) {
-        return application.exit(error) == 0 ? exitOk : exitUsage; // help and version come this way, too
+        return application.exit(error) == 0 ? exitOk : exitUsage; // CLI11 reports help and version as errors, too
     } catch (const std::exception& exception) {
         std::fprintf(stderr, "kesto: %s\n", exception.what());
         return exitFailure;

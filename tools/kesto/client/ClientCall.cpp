@@ -1,5 +1,5 @@
-// The table of the operations says which arguments each takes, in order; the arguments are read one by one, and the
-// first that does not fit ends it. A table of the tool's own adds how a person names an operation and what it calls.
+// The table of the operations says which arguments each takes, in order. The arguments are read one by one, up to the
+// first wrong one. The tool's own table adds the name that a person uses for an operation, and the function to call.
 #include "kesto/client/ClientCall.h"
 
 #include "client/ServiceOperations.h"
@@ -16,7 +16,7 @@ using Json = rapidjson::Value;
 
 using Argument = client::OperationArgument;
 
-// An operation that takes a reporter and nothing else.
+// An operation that takes only a reporter.
 using ReporterOperation = kesto::Status (kesto::Client::*)(kesto::ReporterID reporter, kesto::AnswerCallback answered);
 
 template <ReporterOperation operation>
@@ -62,14 +62,14 @@ constexpr auto forms = std::to_array<Form>({
 });
 static_assert(forms.size() == client::serviceOperations.size());
 
-constexpr unsigned deepest = 30; // what the service takes inside a call
+constexpr unsigned deepest = 30; // the most levels that the service accepts inside a call
 
 std::string_view textOf(const Json& json)
 {
     return {json.GetString(), json.GetStringLength()};
 }
 
-// Adds a value to the array or, under its key, to the dictionary that was begun last. False when it is too deep.
+// Adds a value to the open array or, under its key, to the open dictionary. False if it is nested too deep.
 bool append(kesto::Message& message, const Json& json, unsigned depth = 0)
 {
     if (depth > deepest)
@@ -176,7 +176,7 @@ std::string_view description(Argument argument)
     return "nothing";
 }
 
-// The place of the operation among all of them.
+// The index of the operation in the table.
 std::optional<std::size_t> placeNamed(std::string_view name)
 {
     for (std::size_t place = 0; place < forms.size(); ++place)

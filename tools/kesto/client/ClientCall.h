@@ -16,11 +16,11 @@ struct ClientCall {
     kesto::Category category = kesto::Category::Generic;
     kesto::EventType type = kesto::EventType::Unknown;
     std::optional<std::vector<kesto::ReporterID>> reporters = std::nullopt; // none: all started sessions
-    kesto::Message message = {}; // or the configuration
+    kesto::Message message = {}; // the message or the configuration
 };
 
-// The call, or what is wrong with the line and what was expected.
+// The call, or what is wrong with the line and what it should be.
 [[nodiscard]] std::expected<ClientCall, std::string> parseClientCall(std::string_view line);
 
-// Has the client carry it out.
+// Makes the client's call.
 [[nodiscard]] kesto::Status submit(kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered);

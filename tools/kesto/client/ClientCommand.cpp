@@ -1,5 +1,5 @@
-// `kesto client`: every operation of the service from a shell. One JSON array a line in, one JSON object an answer
-// out, as they come.
+// `kesto client`: every operation of the service from a shell. It reads one JSON array in each line, and prints one
+// JSON object for each answer as it comes.
 #include "client/ServiceOperations.h"
 #include "foundation/values/Json.h"
 #include "foundation/values/Value.h"
@@ -62,12 +62,12 @@ std::string lineOf(const kesto::Answer& answer)
     return line;
 }
 
-// The library takes calls of a quarter of its queue, and the service of 1 MiB.
+// The library takes calls of up to a quarter of its queue, and the service takes up to 1 MiB.
 constexpr std::size_t queueBytes = std::size_t{4} * 1024 * 1024;
-// Such a call, escaped as it may be.
+// The longest such call, with all its escapes.
 constexpr std::size_t longestLine = std::size_t{8} * 1024 * 1024;
 
-// The next line. Of one that is too long only so much is kept as shows it; false at the end of the input.
+// Reads the next line; of a line that is too long, only enough to show this. False at the end of the input.
 bool readLine(std::istream& input, std::string& line)
 {
     line.clear();
@@ -78,8 +78,8 @@ bool readLine(std::istream& input, std::string& line)
     return !line.empty() || input;
 }
 
-// How many answers to wait for at the end: a start is answered when its session stops, which need not happen, and
-// the service type of no reporter is answered twice.
+// How many answers to wait for at the end. A start is answered when its session stops, which may never happen; a call
+// for the service type of reporter 0 is answered twice.
 std::size_t awaitedAnswers(const ClientCall& call)
 {
     if (call.operation == kesto::Operation::StartSession)
@@ -97,7 +97,7 @@ public:
         kesto::Options options;
         options.socketPath = options_.socket;
         options.queueBytes = queueBytes;
-        options.wakeOnSend = true; // nobody here minds a system call, and somebody may be waiting
+        options.wakeOnSend = true; // a person may wait for each answer, and system calls do no harm here
         options.stateChanged = [this](const kesto::StateChange& change) { stateChanged(change); };
         if (const auto status = client_.open(options); status != kesto::Status::Ok) {
             fmt::print(stderr, "kesto client: {}\n", kesto::errorText(status));
@@ -139,18 +139,18 @@ private:
             return;
         std::unique_lock lock(lock_);
         unanswered_ -= awaited;
-        if (status == kesto::Status::NotConnected) // which `stateChanged` is about to tell, in better words
+        if (status == kesto::Status::NotConnected) // `stateChanged` is about to give the reason
             changed_.wait_for(lock, std::chrono::duration<double>(options_.wait), [this] { return isOver_; });
         if (!isOver_)
             fmt::print(stderr, "kesto client: line {}: {}\n", number, kesto::errorText(status));
         hasFailed_ = true;
     }
 
-    // On the library's thread, as what follows.
+    // The following functions run on the library's thread.
     void print(const kesto::Answer& answer)
     {
         if (answer.status() == kesto::Status::ConnectionLost)
-            return; // no answer of the service's; that the connection is over is told behind it
+            return; // the service did not answer; `stateChanged` reports the lost connection
         const std::scoped_lock lock(lock_);
         if (answer.operation() != kesto::Operation::StartSession && unanswered_ > 0)
             --unanswered_;
@@ -158,7 +158,7 @@ private:
         if (isFinished_)
             return;
         const std::string line = lineOf(answer) + '\n';
-        std::fwrite(line.data(), 1, line.size(), stdout); // what cannot be written is told at the end
+        std::fwrite(line.data(), 1, line.size(), stdout); // failures are reported at the end
         std::fflush(stdout);
     }
 
@@ -200,7 +200,7 @@ private:
     const ClientOptions& options_;
     std::mutex lock_;
     std::condition_variable changed_;
-    std::size_t unanswered_ = 0; // answers that are waited for
+    std::size_t unanswered_ = 0; // the number of answers to wait for
     bool isKilling_ = false;
     bool isOver_ = false; // the connection
     bool isFinished_ = false; // waiting for answers

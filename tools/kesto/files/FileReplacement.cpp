@@ -47,7 +47,7 @@ void replaceFile(const fs::path& path, std::string_view text)
     int error = isReady ? platform::writeAll(file.get(), text) : errno;
     if (error == 0 && ::fsync(file.get()) != 0)
         error = errno;
-    file = {}; // who watches the directory is told when a file is closed, too: that shall not be in its place already
+    file = {}; // before the rename: a watcher of the directory must not count closing as a second change
     if (error == 0 && ::rename(temporary.c_str(), path.c_str()) == 0)
         return;
     error = error == 0 ? errno : error;

@@ -1,5 +1,5 @@
-// Files that the service reads: written beside their place and then moved, so that the service never sees an unfinished
-// file.
+// Files that the service reads. Each is written beside its place and then moved, so that the service never sees an
+// unfinished file.
 #pragma once
 
 #include <filesystem>

@@ -12,10 +12,10 @@ struct CloseFile {
 };
 using InputFile = std::unique_ptr<std::FILE, CloseFile>;
 
-// Opens a file, or a pipe, for whose writer it waits, for reading from the beginning to the end. Throws
-// std::runtime_error, which names the file, if it cannot be opened or is a directory.
+// Opens a file for reading from the beginning to the end; for a pipe, waits for its writer. Throws std::runtime_error,
+// which names the file, if it cannot be opened or is a directory.
 [[nodiscard]] InputFile openInput(const std::filesystem::path& path);
 
-// The content of a regular file; not of a pipe or a device, whose size is not known. Throws std::runtime_error, which
-// names the file, if it cannot be read or is larger.
+// The content of a regular file, not of a pipe or a device, because their sizes are unknown. Throws std::runtime_error,
+// which names the file, if it cannot be read or is larger.
 [[nodiscard]] std::string readInput(const std::filesystem::path& path, std::size_t largest);

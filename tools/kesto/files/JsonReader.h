@@ -1,4 +1,4 @@
-// JSON read as values, one after the other, so that of a long list only one element is in memory.
+// Reads JSON as values one after the other, so that only one element of a long list is in memory.
 #pragma once
 
 #include "foundation/values/Value.h"

@@ -4,6 +4,6 @@
 #include <filesystem>
 #include <string_view>
 
-// Writes the text to the path, into what stands there already: a device and a pipe stay what they are. Throws
-// std::runtime_error, which names the path.
+// Writes the text to the path. If something exists there, it writes into it: a device and a pipe stay what they are.
+// Throws std::runtime_error, which names the path.
 void writeOutput(const std::filesystem::path& path, std::string_view text);

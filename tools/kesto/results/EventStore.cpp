@@ -80,7 +80,7 @@ void EventStore::open()
     if (status != SQLITE_OK)
         throw unreadable();
     file_ = file;
-    constexpr int longestWait = 2000; // milliseconds, for a writer that is restarting
+    constexpr int longestWait = 2000; // milliseconds, while a writer restarts
     sqlite3_busy_timeout(opened, longestWait);
 }
 

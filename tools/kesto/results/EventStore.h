@@ -42,7 +42,7 @@ public:
     explicit EventStore(std::filesystem::path database);
 
     // Opens the store again if it could not be read, if it now has a writer, or if it was replaced. Returns true if it
-    // was replaced: event IDs then begin anew.
+    // was replaced: event IDs then start at 1 again.
     bool refresh();
 
     // Calls `visit` with each event that passes the filter, oldest first.

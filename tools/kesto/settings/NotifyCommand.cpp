@@ -1,5 +1,5 @@
-// `kesto notify`: posts a system notification by writing its file: notifications/<name> in the runtime directory, whose
-// text is the state.
+// `kesto notify`: posts a system notification by writing its file, notifications/<name> in the runtime directory. The
+// text of the file is the state.
 #include "kesto/Commands.h"
 #include "kesto/ServiceDirectories.h"
 #include "kesto/files/FileReplacement.h"

@@ -1,4 +1,4 @@
-// The parser, not a search, finds the statements: each is parsed by itself, which gives its key. Only ends of lines
+// The parser, not a search, finds the statements: each is parsed separately, which gives its key. Only ends of lines
 // that may end a statement are tried.
 #include "kesto/settings/TomlText.h"
 
@@ -79,7 +79,8 @@ std::string textOf(const std::vector<Statement>& statements)
     return text;
 }
 
-// The text behind the value: from the first "#" whose removal does not change the statement's meaning.
+// The text behind the value: it begins at the first "#" that can be removed, with the rest of its line, without a
+// change of the statement's meaning.
 std::string tailOf(const std::string& statement)
 {
     const auto meaning = [](std::string_view text) {

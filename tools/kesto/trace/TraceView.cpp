@@ -109,7 +109,7 @@ void printTable(const TraceResultsFile& results, std::size_t width)
     }
 }
 
-// A bar whose part of the columns is the count's part of `most`; never empty for a count above 0.
+// A bar. Its share of the columns is the share of `count` in `most`; it is never empty for a count above 0.
 std::string barText(std::size_t count, std::size_t most, std::size_t columns)
 {
     constexpr std::array<std::string_view, 8> parts{"", "▏", "▎", "▍", "▌", "▋", "▊", "▉"};

@@ -1,4 +1,4 @@
-// The library calls back on a thread of its own; each step waits for this callback.
+// The library calls back on its own thread; each step waits for this callback.
 #include "kesto/trace/TracedSession.h"
 
 #include "kesto/Terminal.h"

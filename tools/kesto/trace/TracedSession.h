@@ -1,8 +1,8 @@
 // A session of the service that traces from `start` to `stop`, any number of times; it ends with its connection at the
 // latest.
 //
-// Two signs show that the service traces: it answers a start at once, and a client that asked may emit events. If the
-// service refuses, the error says where to look.
+// Two signs show that the service traces: it answers a start before the session stops, and a client that asked may emit
+// events. If the service refuses, the error says where to look.
 #pragma once
 
 #include <condition_variable>
@@ -37,7 +37,7 @@ private:
     std::mutex lock_;
     std::condition_variable changed_;
     bool isAnswered_ = false; // the last call
-    bool mayBeTraced_ = false; // the start was answered at once
+    bool mayBeTraced_ = false; // the start was answered before a stop
     std::string problem_;
     kesto::Client client_; // destroyed first: its thread uses the members above
 };
