@@ -82,7 +82,7 @@ std::vector<fs::path> publishAll(const fs::path& root, std::size_t periods)
     return files;
 }
 
-// Nanoseconds a channel.
+// Nanoseconds for each channel.
 double costOfSample(platform::LinuxReportingChannels& channels, const platform::ReportingChannels::Subscribed& of)
 {
     constexpr std::size_t times = 10;

@@ -1,5 +1,5 @@
-// The cost of sending for the thread that calls libkesto, which may be a real-time thread: time, and system calls, of
-// which there must be none. The peer is a program without the library, which writes as many bytes to a socket.
+// The cost of sending for the thread that calls libkesto, which may be a real-time thread: time, and system calls (none
+// are allowed). The peer is a program without the library, which writes as many bytes to a socket.
 #include "Groups.h"
 #include "support/SampleMessage.h"
 #include "support/ServiceProcess.h"
@@ -44,7 +44,7 @@ public:
         settle();
     }
 
-    // Fills the message in anew, with the next number.
+    // Fills the message again, with the next number.
     void build()
     {
         message_.clear()
@@ -107,7 +107,7 @@ void trapSystemCalls()
     ::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program);
 }
 
-// How many a burst makes on its thread.
+// The number of system calls that a burst makes on its thread.
 template <typename Send> double systemCallsOf(Send send)
 {
     systemCalls = 0;
@@ -130,7 +130,7 @@ struct SendTimes {
     std::vector<double> slowest; // of a thousand
 };
 
-// Nanoseconds of single calls of `send`, between which everything is prepared by `prepare` and `settle`.
+// Nanoseconds of single calls of `send`; `prepare` and `settle` run between them.
 template <typename Prepare, typename Send, typename Settle>
 void time(SendTimes& times, Prepare prepare, Send send, Settle settle)
 {
@@ -149,7 +149,7 @@ void time(SendTimes& times, Prepare prepare, Send send, Settle settle)
     times.slowest.push_back(quantile(std::move(each), allButOneOfAThousand));
 }
 
-// Reads and drops.
+// Reads the bytes and drops them.
 ChildProcess runSink(const SocketPair& sockets)
 {
     return ChildProcess::run([&] {

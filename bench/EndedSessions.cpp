@@ -1,5 +1,5 @@
-// What stays of sessions that ended: the memory of a service, a while after three long ones. All rounds run side by
-// side, for that while is the same for all.
+// The memory that ended sessions leave: that of a service, some time after three long sessions. All rounds wait at the
+// same time.
 #include "Groups.h"
 #include "support/SampleMessage.h"
 #include "support/ServiceProcess.h"

@@ -1,4 +1,4 @@
-// The groups of measurements, a file each, in the order of the table.
+// The groups of measurements, each in its own file, in the order of the table.
 #pragma once
 
 #include "support/Harness.h"

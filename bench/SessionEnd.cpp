@@ -99,7 +99,7 @@ std::size_t allocated()
     return info.uordblks + info.hblkhd;
 }
 
-// Of a session in which nothing but the volume changes: each message ends a stretch.
+// For a session in which only the volume changes: each message ends a stretch.
 void measureVolumeEvents(const BenchOptions& options, Report& report)
 {
     constexpr int changeCount = 200'000;

@@ -1,5 +1,5 @@
 // Foreign bytes in the wire format of protocol buffers. Reading must end, return nothing from outside the input, and
-// accept a group only if its content is well-formed by itself; and a record that was read must stay the same when it is
+// accept a group only if its content alone is well-formed; and a record that was read must stay the same when it is
 // written and read again.
 #include "foundation/protobuf/ProtobufReader.h"
 #include "sinks/AudioIssueDetected.h"

@@ -1,8 +1,6 @@
 // The content of a frame, as a call: for all bytes, either the adapter calls one operation and its answers go back
-// under the call's number, or it refuses the call, calls no operation and sends no answer. Afterwards no code holds the
-// caller's connection.
-//
-// Which of the two it is, the table of the operations tells.
+// under the call's number, or it refuses the call, calls no operation and sends no answer. The table of the operations
+// says which. Afterwards no code holds the caller's connection.
 //
 // The input is one CBOR item.
 #include "client/ServiceOperations.h"
@@ -31,7 +29,7 @@ void require(bool holds)
         std::abort();
 }
 
-// Answers every operation at once, except killing, which is never answered.
+// Answers every operation immediately, except killing, which is never answered.
 class AnsweringProtocol final : public KestoReportingServiceProtocol {
 public:
     void createReportingSession(std::int64_t, SuccessReply reply) override { answer(reply, true); }
@@ -111,7 +109,7 @@ bool fits(client::OperationArgument argument, const Value& value)
                  : value.isNull();
 }
 
-// The operation that the frame calls; null pointer when the frame is not a call.
+// The operation that the frame calls, or null if the frame is not a call.
 const client::ServiceOperation* operationOf(std::span<const Value> frame)
 {
     if (frame.size() < 2 || !frame[0].exactly<std::uint64_t>())
@@ -147,7 +145,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
 
     const client::ServiceOperation* operation = operationOf(call->values());
     require(result.has_value() == (operation != nullptr));
-    require(connection.use_count() == 1); // nobody answers later
+    require(connection.use_count() == 1); // no code can answer later
     require(protocol->calls == (result ? 1 : 0));
     require(connection->sent.empty() == (!result || protocol->isKilled));
     require(result || !result.error().reason.empty());

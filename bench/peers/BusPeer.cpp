@@ -1,5 +1,5 @@
-// A server and a client with sd-bus, and the data with which a raw client can replace the latter: the bytes of a call,
-// read off the wire, and the length of an answer.
+// A server and a client with sd-bus, and the data with which a raw client can replace this client: the bytes of a call,
+// read from the wire, and the length of an answer.
 #include "peers/BusPeer.h"
 
 #include "support/SampleMessage.h"

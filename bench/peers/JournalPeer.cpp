@@ -65,7 +65,7 @@ void bringJournaldHome(const fs::path& directory)
     fs::create_directories("/run/systemd/journal");
     fs::create_directories("/run/systemd/journald.conf.d");
     writeFile("/run/systemd/journald.conf.d/bench.conf", configuration);
-    writeFile("/run/systemd/journal/flushed", ""); // writes to the disk at once, as after the system's start
+    writeFile("/run/systemd/journal/flushed", ""); // writes to the disk immediately, as after the system's start
 }
 
 template <typename Condition> void waitUntil(Condition condition, std::string_view what)

@@ -20,12 +20,12 @@ namespace bench {
 struct BenchOptions {
     static constexpr int fewestRounds = 5;
     int rounds = 7;
-    std::string filter; // groups whose name contains it are measured
+    std::string filter; // only groups with this text in their names are measured
     std::filesystem::path service; // the program kestod
     std::filesystem::path json; // where the results are written, unless it is empty
 };
 
-// The figures of one contestant, one a round.
+// The figures of one contestant, one for each round.
 class Series {
 public:
     Series() = default;
@@ -50,7 +50,7 @@ template <std::invocable... Each>
     return compete(options, what, std::span<const Contestant>(all));
 }
 
-// The value in the middle when all are sorted; of an even number the higher of the two.
+// The middle one of the sorted values; of an even number the higher of the two.
 [[nodiscard]] double median(std::vector<double> values);
 // The value that this share (0 to 1) of all values does not exceed.
 [[nodiscard]] double quantile(std::vector<double> values, double share);

@@ -1,7 +1,7 @@
-// The platform of what is measured inside this process: nothing on it costs time, so that the service's own work is
-// what remains. Whatever is submitted to a queue is done at once; nobody wants any event; nothing is logged that is
-// not logged by default, and that goes nowhere; no driver publishes a channel, and nothing traces. There are no files,
-// unless a file system is given: then it is that of an internal build, which writes some.
+// The platform of what is measured inside this process. It costs no time, so that only the service's own work remains:
+// a queue runs each item immediately, no event is wanted, the log drops its lines and has the default levels, no driver
+// publishes a channel, and no trace runs. It has no files unless a file system is given; then it is that of an internal
+// build, which writes some.
 #pragma once
 
 #include "platform/Platform.h"

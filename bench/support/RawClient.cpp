@@ -89,7 +89,7 @@ std::size_t RawClient::readAnswers(int flags)
 
 void RawClient::pipeline(std::size_t count)
 {
-    constexpr std::size_t together = 32; // requests that are written at once
+    constexpr std::size_t together = 32; // requests that are written together
     std::string unwritten;
     std::size_t begun = 0;
     std::size_t answered = 0;

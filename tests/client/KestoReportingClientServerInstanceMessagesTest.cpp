@@ -1,4 +1,4 @@
-// The delivery of a message: to whom, in which order, and as whose.
+// The delivery of a message: its receivers, its order, and its sender.
 #include "client/KestoReportingClientServerInstance.h"
 #include "support/ServiceHarness.h"
 
@@ -46,7 +46,7 @@ protected:
         platform.analytics.clear();
         return client.call(SendMessage, message, 4, 1, reporterIDs);
     }
-    // What the session recorded under its first Playback message.
+    // The content that the session recorded under its first Playback message.
     static std::optional<Dictionary> recorded(const TestClient& client, std::int64_t reporterID)
     {
         const auto messages = client.session(reporterID)->nestedAggregatedPayloadData().value();
@@ -132,7 +132,7 @@ TEST_F(MessagesTest, SkipZeroAndIDsThatNobodyHas)
     EXPECT_NE(recorded(player, 42), std::nullopt);
 }
 
-// A large message to many sessions would hold up all clients.
+// Without a limit, a large message to many sessions would delay all clients.
 TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
 {
     constexpr std::int64_t sessions = 100;
@@ -154,9 +154,9 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
     };
     EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered)) << "the client is answered as always";
     EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1));
-    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers)) << "and those that there are not do not count";
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers)) << "unknown sessions do not count";
     EXPECT_EQ(send(player, Array(reporterIDs)), answeredOnce(delivered));
-    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * sessions)) << "a small one reaches all";
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * sessions)) << "a small message reaches all";
 
     for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID)
         player.call(StartReportingSessionForID, reporterID);
@@ -164,7 +164,7 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
     EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers));
     EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1002)).Times(1));
     EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered));
-    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1)) << "the log has the first";
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1)) << "the first refusal is logged";
 
     platform.analytics.clear();
     player.close();
@@ -232,7 +232,7 @@ TEST_F(MessagesTest, WithoutAListReachAStartedSessionZeroToo)
     EXPECT_NE(recorded(player, 0), std::nullopt);
 }
 
-// --- to nobody's session
+// --- to unknown sessions
 
 TEST_F(MessagesTest, WithoutAListAndAnyStartedSessionAreDeliveredOnceThroughAStandaloneOne)
 {
@@ -259,14 +259,14 @@ TEST_F(MessagesTest, LetGoOfTheStandaloneSession)
     send(player, null);
     EXPECT_EQ(player.session(1), nullptr);
     EXPECT_EQ(player.call(GetAllReporters), answeredOnce({null, Array{}}));
-    platform.analytics.clear(); // which held it for a payload to come
+    platform.analytics.clear(); // it kept the earlier payload
     EXPECT_EQ(platform.log.lines().back().message, "deallocing this session 1");
     EXPECT_EQ(platform.traceEmitter.take().back(), sessionDestroyed);
 }
 
 // --- order
 
-// One journal of what happens at the session, the analytics bridge and the bug-capture manager.
+// One journal of the session, the analytics bridge and the bug-capture manager.
 class DeliveryOrderTest : public MessagesTest {
 protected:
     DeliveryOrderTest() : MessagesTest([](TestPlatform& prepared) { prepared.deviceProperties.setInternalBuild(true); })
@@ -313,7 +313,7 @@ TEST_F(DeliveryOrderTest, PutsTheStandaloneSessionLast)
                             "Incrementing Vorp counter. recorder", "sending message for session owned by 1"));
 }
 
-// --- what the client asks of the service
+// --- the client's requests to the service
 
 class MockService : public KestoReportingServiceDelegateProtocol {
 public:
@@ -399,7 +399,7 @@ TEST_F(ClientAndServiceTest, HandsTheMessageItsSessionAndTheSendersNameToTheBugC
     EXPECT_CALL(*service, handleEventForVorp(_, _, _, session(42), "client"));
     EXPECT_CALL(*service, handleEventForVorp(_, _, _, session(42), "(null)"));
     {
-        // Whoever makes the call, not whoever the client was made for.
+        // The sender is the process that makes the call, not the one that the client was made for.
         const FakeConnection callers(18);
         const platform::Connection::CallScope call(callers);
         send(std::vector<std::int64_t>{42});
@@ -492,7 +492,7 @@ TEST_F(ClientAndServiceTest, StartsInOrder)
         return Dictionary{{"ringerstate", true}};
     });
     EXPECT_CALL(*service, getAllActiveReportingSessions).WillOnce([&] {
-        EXPECT_THAT(*session(42)->nestedAggregatedPayloadData(), SizeIs(1)) << "the features were told";
+        EXPECT_THAT(*session(42)->nestedAggregatedPayloadData(), SizeIs(1)) << "the session got the features";
         return KestoReportingServiceDelegateProtocol::Sessions{};
     });
     client->startReportingSessionForID(42, [&](auto&, const auto&, bool) { ++answers; });

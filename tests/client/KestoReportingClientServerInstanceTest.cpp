@@ -1,5 +1,5 @@
-// A client's operations on sessions, called through the protocol: what is answered, what is said in which order, and
-// whose sessions each of them reaches.
+// A client's operations on sessions, called through the protocol: their answers, their log lines in order, and which
+// client's sessions each of them reaches.
 #include "client/KestoReportingClientServerInstance.h"
 #include "platform/linux/connection/FrameReader.h"
 #include "support/ServiceHarness.h"
@@ -31,7 +31,7 @@ constexpr std::uint32_t sessionMessageAccepted = 0x21044838;
 
 constexpr Answers::size_type once = 1;
 
-// The description of a session of the first client without service type and configuration.
+// The description of a session of the first client, without service type and configuration.
 std::string described(std::int64_t reporterID, bool started)
 {
     return "\"reporterID=" + std::to_string(reporterID)
@@ -45,7 +45,7 @@ protected:
     TestClient recorder = harness.connect("recorder");
     TestPlatform& platform = harness.platform;
 
-    // What was said, but for what a session says of its volume when it stops.
+    // The log lines, except those about a stopping session's volume.
     [[nodiscard]] std::vector<LogLine> lines() const
     {
         auto lines = harness.platform.log.lines();
@@ -194,7 +194,7 @@ TEST_F(ClientServerInstanceTest, NeverAnswersTheStartOfASessionThatWasReplaced)
     create(42);
     stop(42);
     EXPECT_EQ(player.answersTo(started), unanswered);
-    EXPECT_EQ(player.connection().unansweredCalls(), 0U) << "and nothing waits for it";
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U) << "no work waits for it";
 }
 
 TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanItMayHave)
@@ -212,12 +212,13 @@ TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanItMayHave)
                                 "ones are counted until it goes");
     EXPECT_THAT(lines(), ElementsAre(IsLine(Debug, "kerc", "creating session for reporter 10001"), refused));
     EXPECT_EQ(create(most + 2), answeredOnce(succeeded));
-    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused).Times(1)) << "the log has the first, all count";
+    EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(refused).Times(1))
+        << "the first refusal is logged, all are counted";
     const auto replaced = player.session(1);
     EXPECT_EQ(create(1), answeredOnce(succeeded));
-    EXPECT_NE(player.session(1), replaced) << "one that is there already may be replaced";
+    EXPECT_NE(player.session(1), replaced) << "an existing session may be replaced";
     EXPECT_EQ(recorder.call(CreateReportingSession, most + 1), answeredOnce(succeeded));
-    EXPECT_NE(recorder.session(most + 1), nullptr) << "another client has a limit of its own";
+    EXPECT_NE(recorder.session(most + 1), nullptr) << "each client has its own limit";
 
     player.call(DestroyReportingSession, 2);
     create(most + 1);
@@ -230,7 +231,7 @@ TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanItMayHave)
                     Error, "kerc", "client 1001 was refused 2 sessions: it may have 10000, and all clients 110000")));
 }
 
-// All their IDs are answered in one frame.
+// One frame must hold the IDs of all sessions.
 TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanAllClientsMayHaveTogether)
 {
     constexpr std::size_t longestID = 9; // bytes of CBOR
@@ -260,7 +261,7 @@ TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanAllClientsMayHaveToget
                     Error, "kerc", "client 17 was refused 3 sessions: it may have 10000, and all clients 110000")));
     clients.pop_back();
     fill(3);
-    EXPECT_EQ(clients.back()->clientReportingSessionMap().size(), 3U) << "those of a client that goes make room";
+    EXPECT_EQ(clients.back()->clientReportingSessionMap().size(), 3U) << "the sessions of a client that goes make room";
 }
 
 // --- set service type
@@ -353,7 +354,7 @@ TEST_F(ClientServerInstanceTest, AnswersTheServiceTypeOfItsOwnSessionZeroTheSeco
     create(0);
     EXPECT_EQ(player.call(GetServiceNameForReporterID, 0), (Answers{{null, 65535}, {null, 0}}));
     EXPECT_EQ(recorder.call(GetServiceNameForReporterID, 0), (Answers{{null, 65535}, {null, 65535}}))
-        << "nobody else finds it";
+        << "no other client finds it";
 }
 
 // --- set configuration
@@ -652,7 +653,7 @@ TEST_F(ClientServerInstanceTest, DestroysAStartedSessionWithoutAnsweringItsStart
     EXPECT_EQ(player.call(DestroyReportingSession, 42), answeredOnce(succeeded));
     EXPECT_EQ(player.session(42), nullptr);
     EXPECT_EQ(player.answersTo(started), unanswered);
-    EXPECT_EQ(player.connection().unansweredCalls(), 0U) << "nobody can answer it any more";
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U) << "no code can answer it any more";
     EXPECT_THAT(lines(),
                 ElementsAre(IsLine(Debug, "kerc", "destroying session for reporter 42"),
                             IsLine(Debug, "kerr", "ending session 42"), IsLine(Debug, "kerr", "ending session 42"),
@@ -755,7 +756,7 @@ TEST_F(ClientServerInstanceTest, ListsNothingForWhoIsGone)
     EXPECT_EQ(recorder.call(GetAllReporters), answeredOnce({null, Array{}}));
 }
 
-// --- what the log shows of many sessions
+// --- how the log shows many sessions
 
 TEST_F(ClientServerInstanceTest, DescribesNoMoreSessionsThanALogLineShows)
 {
@@ -765,7 +766,7 @@ TEST_F(ClientServerInstanceTest, DescribesNoMoreSessionsThanALogLineShows)
     for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID) {
         player.submit(CreateReportingSession, {reporterID});
         player.submit(SetConfiguration, {configuration, reporterID});
-        platform.workQueues.runAll(); // a client that is not answered is not read from for long
+        platform.workQueues.runAll(); // beyond a number of unanswered calls, reading from a client pauses
     }
     harness.forget();
     start(1);
@@ -802,7 +803,7 @@ TEST_F(ClientDeathTest, EndsTheProcessAtOnceWithoutWhatIsLeftForItsExit)
         std::atexit([] { std::_Exit(7); });
         player.submit(KillService, {});
     };
-    EXPECT_EXIT(killWithAnExitHandler(), testing::ExitedWithCode(2), "") << "other threads are at work then";
+    EXPECT_EXIT(killWithAnExitHandler(), testing::ExitedWithCode(2), "") << "other threads run then";
 }
 
 // --- connection loss
@@ -886,7 +887,7 @@ TEST_F(ClientServerInstanceTest, CarriesOutTheCallsThatCameBeforeItsEnd)
 // --- without the service
 
 // The service object is gone. One client has the session 41, which is created, and 42, which is started; another client
-// has 43. Every operation is answered, and does what it can do without the service object.
+// has 43. Every operation is answered, and does what is possible without the service object.
 class OrphanTest : public ClientServerInstanceTest {
 protected:
     OrphanTest()
@@ -947,7 +948,7 @@ TEST_F(OrphanTest, DeliversNoMessage)
         << "reporting is not disabled";
     EXPECT_EQ(player.call(SendMessage, Dictionary{{"a", 1}}, 4, 1, null), answeredOnce(delivered));
     EXPECT_THAT(*player.session(42)->nestedAggregatedPayloadData(), IsEmpty());
-    EXPECT_THAT(platform.log.lines("kerr"), IsEmpty()) << "there is no stand-alone session either";
+    EXPECT_THAT(platform.log.lines("kerr"), IsEmpty()) << "a stand-alone session does not exist either";
 }
 
 TEST_F(OrphanTest, StopsNoSession)

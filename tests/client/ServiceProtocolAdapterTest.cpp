@@ -1,5 +1,5 @@
-// What is on the wire, call by call: which operation a frame means, what is refused and in which words, and how
-// answers look.
+// The wire, call by call: which operation a frame means, which frames are refused and with which words, and the form of
+// answers.
 #include "client/ServiceProtocolAdapter.h"
 #include "client/ServiceOperations.h"
 #include "support/fakes/FakeConnection.h"
@@ -50,7 +50,7 @@ protected:
         return result ? std::nullopt : std::optional(result.error().reason);
     }
     void accept(const Array& frame) { EXPECT_EQ(refusal(frame), std::nullopt); }
-    // Ends the turn: all that was answered.
+    // Ends the turn, and returns all its answers.
     const std::vector<Array>& answers()
     {
         if (auto send = turn.letters.take())
@@ -59,13 +59,13 @@ protected:
     }
 
     platform::Turn turn;
-    // A strict mock: whatever is called unexpectedly is a failure.
+    // A strict mock: every unexpected call is a failure.
     std::shared_ptr<StrictMock<MockProtocol>> protocol = std::make_shared<StrictMock<MockProtocol>>();
     std::shared_ptr<support::FakeConnection> connection = std::make_shared<support::FakeConnection>(7);
     client::ServiceProtocolAdapter adapter{protocol};
 };
 
-// --- what a call means
+// --- the meaning of a call
 
 TEST_F(AdapterTest, CallsEachOperationByItsNumberWithItsArgumentsInOrder)
 {
@@ -123,7 +123,7 @@ TEST_F(AdapterTest, TakesIntegersUpToTheEndsOfTheirRanges)
     accept({1, 6, Dictionary{}, 0xFFFFFFFFU, 0xFFFF, null});
 }
 
-// --- what is refused
+// --- refused calls
 
 TEST_F(AdapterTest, RefusesWhatIsNoCall)
 {
@@ -150,7 +150,7 @@ TEST_F(AdapterTest, RefusesMethodsThatThereAreNot)
 
 TEST_F(AdapterTest, RefusesMethodsThatAreNoNumbersWithoutRepeatingThem)
 {
-    // What a client sends does not get into the log, where it could fill a disk or forge lines.
+    // Text from a client does not get into the log, where it could fill a disk or forge lines.
     for (const Value& method : {null, Value(1.0), Value(true), Value("1\nkestod: all is well"),
                                 Value(std::string(1 << 20, 'x')), Value(Array{1}), Value(largestCall)})
         EXPECT_EQ(refusal({1, method, 42}), "a call's method is an integer from 1 to 11");
@@ -160,7 +160,7 @@ struct CalledOperation {
     int number;
     std::string name;
     std::vector<std::string> argumentNames;
-    std::vector<Value> arguments; // good ones
+    std::vector<Value> arguments; // valid ones
 };
 
 void PrintTo(const CalledOperation& operation, std::ostream* out)
@@ -181,7 +181,7 @@ const std::vector<CalledOperation> operations{
     {10, "getAllReporters", {}, {}},
     {11, "killService", {}, {}}};
 
-// What each argument has to be, and what therefore does not fit.
+// What each argument has to be, and the values that do not fit.
 struct Expectation {
     std::string words;
     std::vector<Value> wrong;
@@ -270,7 +270,7 @@ TEST_F(AdapterTest, RefusesListsOfAnythingButIntegers)
                   "sendMessage: argument reporter IDs is not an array of 64-bit integers");
 }
 
-// A message is worth as much work at each of them, and each takes no more than a byte of the frame.
+// A message costs as much work for each reporter, and each reporter takes only a few bytes of the frame.
 TEST_F(AdapterTest, RefusesListsOfMoreReportersThanAMessageMayHave)
 {
     constexpr std::size_t most = client::mostReportersOfAMessage;
@@ -284,7 +284,7 @@ TEST_F(AdapterTest, RefusesListsOfMoreReportersThanAMessageMayHave)
               "sendMessage: argument reporter IDs is not an array of at most 10000 elements");
 }
 
-// --- what is answered
+// --- answers
 
 TEST_F(AdapterTest, AnswersWithTheCallsNumberTheErrorAndTheValues)
 {

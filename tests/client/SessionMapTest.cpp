@@ -40,7 +40,7 @@ TEST_F(SessionMapTest, BeginsEmpty)
     EXPECT_EQ(map.begin(), map.end());
 }
 
-// Whoever knows how many buckets there are could otherwise have all IDs in one of them.
+// Otherwise a client that knows the number of buckets could choose IDs that all fall into one.
 TEST(SessionMapHash, SpreadsIDsWhateverTheirDistance)
 {
     constexpr std::size_t count = 10'000;

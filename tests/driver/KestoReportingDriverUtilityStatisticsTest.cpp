@@ -1,4 +1,4 @@
-// How the drivers' channels changed during a session, as text, and the receivers of the text.
+// How the drivers' channels changed during a session, as text, and which services get the text.
 #include "driver/KestoReportingDriverUtility.h"
 #include "support/TestPlatform.h"
 
@@ -465,7 +465,7 @@ TEST_F(DriverLogs, TellEveryDriverOfWhichAChannelIs)
     begin();
     both.value = 4;
     publish(both);
-    EXPECT_THAT(end(), ElementsAre("Cavlet_Simple_1: 3")) << "found by its group and by its subgroup, said once";
+    EXPECT_THAT(end(), ElementsAre("Cavlet_Simple_1: 3")) << "found by its group and by its subgroup, reported once";
 }
 
 TEST_F(DriverLogs, ReportAStateChannelInWhichNoTimePassed)

@@ -124,7 +124,7 @@ TEST_F(DriverUtility, LeavesOutADriverWhoseChannelsCannotBeHad)
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerd", "error 7 getting channels for driver Rx-(null)")));
     EXPECT_THAT(platform.log.lines(),
                 Not(Contains(IsLine(Info, "kerd", "couldn't find any channels for driver group Rx-(null)"))))
-        << "nothing came back that could be counted";
+        << "there was no channel to count";
     EXPECT_THAT(descriptions(utility), SizeIs(7));
     EXPECT_THAT(descriptions(utility), Not(Contains("Rx-(null)")));
 }

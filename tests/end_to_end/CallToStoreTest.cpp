@@ -106,7 +106,7 @@ TEST_F(CallToStoreTest, ASessionOfAnotherClientIsReachedBySendingAndValidatingBu
     EXPECT_EQ(other.ask(Validate, 5), (Array{1, null, Dictionary{{"reporterID", 5}, {"serviceType", 3}}}));
     EXPECT_EQ(other.ask(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, Array{5}), (Array{2, null}));
     EXPECT_THAT(kestod.events("com.quarn.haptics.*"), SizeIs(1));
-    EXPECT_EQ(other.ask(Start, 5), success(3)); // at once: not its own
+    EXPECT_EQ(other.ask(Start, 5), success(3)); // immediately: another client's session
     EXPECT_EQ(other.ask(GetAllReporters), (Array{4, null, Array{5}}));
 }
 
@@ -124,7 +124,7 @@ TEST_F(CallToStoreTest, TheAnswerToAStartIsHeldUntilTheStopAndOtherCallsOvertake
     WireClient client(kestod.socketPath());
     client.ask(Create, 1);
     const auto start = client.call(Start, 1);
-    EXPECT_EQ(client.ask(Start, 1), success(3)); // already started: at once
+    EXPECT_EQ(client.ask(Start, 1), success(3)); // already started: answered immediately
     EXPECT_EQ(client.ask(GetAllReporters), (Array{4, null, Array{1}}));
     const auto stop = client.call(Stop, 1);
     EXPECT_EQ(client.nextReply(), success(start));
@@ -228,13 +228,13 @@ TEST_F(CallToStoreTest, AResetIsAnInterruptionAndThenAnInvalidationAndStopsSessi
     EXPECT_THAT(kestod.waitForEvents(uptimeEvent), SizeIs(1));
 }
 
-// A connection may end before the busy server queue registers it. It then has no uptime yet, which is logged; it is
-// registered and removed all the same.
+// A connection may end before the busy server queue registers it. It then has no uptime yet, which is logged, but it is
+// still registered and removed.
 TEST(CrowdedRoadTest, EveryConnectionThatComesAndVanishesBesideABusyClientIsRegisteredAndRemoved)
 {
     constexpr std::size_t connections = 10'000;
     Kestod kestod({}, {{"KESTO_LOG", "default"}});
-    kestod.startAndAwait(); // with a first connection, which ends at once
+    kestod.startAndAwait(); // with a first connection, which ends immediately
     std::jthread busy([&](const std::stop_token& isOver) {
         WireClient client(kestod.socketPath());
         client.ask(Create, 1);
@@ -405,7 +405,7 @@ TEST(InternalRoadTest, OldSummaryFilesGoWhenThereAreTooMany)
     std::filesystem::create_directories(folder);
     for (std::size_t number = 0; number < most; ++number)
         support::writeFile(folder / ("20260101-000000+0000-kesto-" + std::to_string(number) + "-generic.json"), "[]");
-    support::writeFile(folder / "notes.txt", "of somebody else");
+    support::writeFile(folder / "notes.txt", "of another program");
     kestod.start();
     WireClient client(kestod.socketPath());
     client.ask(Create, 1);

@@ -129,7 +129,7 @@ protected:
                      reporter);
         return start();
     }
-    // If the service traces, a start is answered at once, and again at the stop.
+    // If the service traces, it answers a start immediately, and again at the stop.
     [[nodiscard]] bool start()
     {
         startCall = session->call(Start, reporter);
@@ -261,7 +261,7 @@ TEST_F(KernelTraceTest, EndsTheServiceWithStatusOneWhenItsResultsCannotBeWritten
     session->call(Stop, reporter);
     EXPECT_EQ(kestod.exitStatus(), 1);
     EXPECT_EQ(kestod.countInLog(resultsPath.native() + " is a directory: remove it\n"), 1U);
-    EXPECT_TRUE(kestod.log().ends_with("Failed to open quilldat writer\n")) << "nothing is said after it";
+    EXPECT_TRUE(kestod.log().ends_with("Failed to open quilldat writer\n")) << "nothing is logged after it";
 }
 
 TEST_F(KernelTraceTest, MeasuresAgainWhenTheServiceWasKilledDuringATrace)

@@ -176,7 +176,7 @@ std::vector<StoreRow> Kestod::events(std::string_view pattern) const
 
 std::vector<StoreRow> Kestod::waitForEvents(std::string_view pattern) const
 {
-    waitUntil([&] { return !readEvents(pattern).value_or(std::vector<StoreRow>()).empty(); }); // it may not be made yet
+    waitUntil([&] { return !readEvents(pattern).value_or(std::vector<StoreRow>()).empty(); }); // no store exists yet
     return events(pattern);
 }
 

@@ -62,15 +62,15 @@ public:
     // Needs the right to mount.
     void hide(const std::filesystem::path& folder) { hidden_ = folder; }
 
-    // Starts the process; clients that connect at once wait for it.
+    // Starts the process; clients that connect immediately must wait until it listens.
     void start(const InheritedDescriptors& inherited = {});
     // The same, for clients that do not wait: returns when the service listens.
     void startAndAwait();
     void kill();
-    // Waits for the process to end by itself.
+    // Waits for the process to end without a signal from the test.
     [[nodiscard]] int exitStatus();
 
-    // Of a process that was started.
+    // For a process that was started.
     [[nodiscard]] pid_t process() const { return process_; }
     [[nodiscard]] const std::filesystem::path& directory() const { return directory_.path(); }
     [[nodiscard]] std::filesystem::path socketPath() const { return directory() / "run" / "kesto.socket"; }
@@ -80,7 +80,7 @@ public:
     [[nodiscard]] bool waitForLog(std::string_view text) const;
     [[nodiscard]] std::size_t countInLog(std::string_view text) const;
 
-    // The stored events of names that match the pattern (GLOB), in order. Throws when the store cannot be read.
+    // The stored events of names that match the pattern (GLOB), in order. Throws if the store cannot be read.
     [[nodiscard]] std::vector<StoreRow> events(std::string_view pattern = "*") const;
     // Waits for such an event.
     [[nodiscard]] std::vector<StoreRow> waitForEvents(std::string_view pattern) const;

@@ -1,5 +1,5 @@
-// What the service's memory does when long sessions end, as the system sees it: how much it becomes meanwhile, and that
-// the system gets it back.
+// The service's memory when long sessions end, as the system sees it: how large it becomes, and that the system gets it
+// back.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 #include "support/Sanitizers.h"
@@ -42,7 +42,7 @@ protected:
     }
     void forgetMostMemory() const { std::ofstream("/proc/" + std::to_string(kestod.process()) + "/clear_refs") << "5"; }
 
-    // Begins a session and sends so many messages, each with another volume.
+    // Begins a session and sends so many messages, each with a different volume.
     void play(int reporter, int count)
     {
         constexpr int unanswered = 4000; // more than a helping thread would run
@@ -64,7 +64,8 @@ protected:
         last = client->call(Destroy, reporter);
         awaitAnswers();
     }
-    // The same at the end of a burst that is too long for the connections' thread to help with: the queue's own works.
+    // The same at the end of a burst that is too long for the connection thread to help with, so that the queue's own
+    // thread runs it.
     void endInABurst(int reporter)
     {
         constexpr int burst = 4000;
@@ -89,7 +90,7 @@ protected:
         return std::chrono::milliseconds((user + system) * 1000 / ::sysconf(_SC_CLK_TCK));
     }
 
-    // Has three sessions end, and waits until the system has their memory and the service sleeps again.
+    // Makes three sessions end, and waits until the system has their memory and the service sleeps again.
     template <typename End> void expectBackAfter(End endSession)
     {
         constexpr int changes = 60'000;
@@ -119,7 +120,7 @@ protected:
 
 TEST_F(MemoryTest, StaysBelowTwiceTheBoundOfVolumeEventsWhileASessionEnds)
 {
-    constexpr int changes = 230'000; // more than have room within the bound
+    constexpr int changes = 230'000; // more than the limit has room for
     constexpr double mostMegabytes = 128;
     play(2, changes);
     const double before = megabytes("VmRSS");

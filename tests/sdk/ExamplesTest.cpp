@@ -89,7 +89,7 @@ protected:
         EXPECT_EQ(*calls[5][2].dictionary()->find("session_output_running"), foundation::Value(false));
     }
 
-    // Runs a driver helper, whose channels must exist as long as it runs.
+    // Runs a driver helper. Its channels must exist as long as it runs.
     static void expectPublishes(const std::string& program)
     {
         const support::TemporaryDirectory runtime;

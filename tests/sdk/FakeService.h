@@ -66,15 +66,15 @@ public:
 
     // Waits for so many calls, or until the time is over, and returns all calls so far.
     [[nodiscard]] std::vector<foundation::Array> waitForCalls(std::size_t count);
-    [[nodiscard]] std::size_t connections() const; // that were made so far
+    [[nodiscard]] std::size_t connections() const; // the number made so far
 
-    // On the service's thread, for each client that is connected; returns when it is done.
+    // Calls the function on the service's thread for each connected client; returns when all calls are done.
     void forEachPeer(const std::function<void(Peer& peer)>& action);
     void disconnectAll()
     {
         forEachPeer([](Peer& peer) { peer.close(); });
     }
-    // While off, nothing is read from clients.
+    // While this is off, the service reads nothing from clients.
     void setReading(bool isReading);
 
 private:

@@ -1,4 +1,4 @@
-// Programs that a test runs: input, output, exit status. They end with the object at the latest.
+// Programs that a test runs: input, output, exit status. The destructor ends a running program.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -14,7 +14,7 @@ namespace sdk_test {
 
 class Process {
 public:
-    using Arguments = std::vector<std::string>; // the program, found in PATH, first
+    using Arguments = std::vector<std::string>; // the program, found in PATH, and its arguments
     using Environment = std::vector<std::string>; // "NAME=value", beside those of the test; "NAME" removes one
 
     explicit Process(const Arguments& arguments, const Environment& environment = {});
@@ -26,9 +26,9 @@ public:
     void closeInput() { input_ = {}; }
     void signal(int number);
 
-    // The output so far, once it contains the text, or the program or patience is at its end.
+    // The output so far, as soon as it contains the text, the program has ended, or the wait has timed out.
     [[nodiscard]] std::string waitForOutput(const std::string& text);
-    // The exit status once it has ended; 128 and the signal's number when one ended it; nothing when it does not end.
+    // The exit status; 128 and the signal's number if a signal ended it; nothing if it does not end in time.
     std::optional<int> wait();
     [[nodiscard]] std::string output() const;
     [[nodiscard]] std::string errors() const;
@@ -47,7 +47,7 @@ private:
     foundation::Condition changed_;
     std::string output_ KESTO_GUARDED_BY(mutex_);
     std::string errors_ KESTO_GUARDED_BY(mutex_);
-    bool hasEnded_ KESTO_GUARDED_BY(mutex_) = false; // what it writes
+    bool hasEnded_ KESTO_GUARDED_BY(mutex_) = false; // the end of its output
     std::thread collector_;
 };
 

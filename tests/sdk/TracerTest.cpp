@@ -158,7 +158,7 @@ TEST_F(TracerTest, OfAClientThatDidNotAskForItEmitsNothing)
     const kesto::Tracer tracer(client);
     ASSERT_EQ(client.validate(1, nullptr), Status::Ok);
     ASSERT_EQ(client.flush(patience), Status::Ok);
-    EXPECT_EQ(requests, 0) << "nor does the service hear of it";
+    EXPECT_EQ(requests, 0) << "the service does not get it either";
     EXPECT_FALSE(tracer.isActive());
     tracer.emit(1);
     kesto_tracer_emit(tracer.get(), 1, 0, 0, 0, 0);
@@ -277,7 +277,7 @@ TEST_F(TracerTest, KeepsNoDescriptorThatItIsNotToHave)
     });
     ASSERT_EQ(client.validate(1, nullptr), Status::Ok);
     ASSERT_EQ(client.flush(patience), Status::Ok);
-    EXPECT_LE(openDescriptors(), before + 2) << "at most those that came last";
+    EXPECT_LE(openDescriptors(), before + 2) << "at most the last ones";
     client = {};
     service.reset();
 }
@@ -292,7 +292,7 @@ TEST_F(TracerTest, CallsNothingAndAllocatesNothingForRealTime)
     errno = EXDEV;
     const auto before = sdk_test::allocations();
     tracer.emit(1);
-    const int error = errno; // at once, because later code may change it
+    const int error = errno; // first, because later code may change it
     EXPECT_EQ(sdk_test::allocations(), before);
     EXPECT_EQ(error, EXDEV);
     out = {};

@@ -25,7 +25,7 @@ protected:
     ClientConnectionTest()
     {
         platform.processTable.add(pid, "player");
-        platform.analytics.use("com.quarn.*"); // as a device does unless its owner says otherwise
+        platform.analytics.use("com.quarn.*"); // as on a device, unless its owner has other settings
         platform.clock.set(startDate);
     }
 
@@ -72,7 +72,8 @@ TEST_F(ClientConnectionTest, IsRegisteredOnTheServerQueue)
     EXPECT_EQ(clients()[0]->processIdentifier(), pid);
     EXPECT_EQ(clients()[0]->clientStartDate(), startDate);
     EXPECT_EQ(clients()[0]->clientProcessName(), "player");
-    EXPECT_THAT(platform.processTable.forgotten(), ElementsAre(pid)) << "the name is that of now, since it is kept";
+    EXPECT_THAT(platform.processTable.forgotten(), ElementsAre(pid))
+        << "the client keeps the name, so it must be the current one";
 }
 
 TEST_F(ClientConnectionTest, IsRegisteredBeforeItsFirstCallIsServed)
@@ -239,7 +240,7 @@ TEST_F(ClientConnectionTest, WhoseClientIsFreedAlreadyKnowsNothingOfIt)
 {
     const auto connection = connect();
     connection->interrupt();
-    connection->setCallHandler(nullptr); // the connection's own hold on its client
+    connection->setCallHandler(nullptr); // the connection owns its client
     platform.workQueues.runAll();
     harness.forget();
     connection->close();

@@ -356,7 +356,7 @@ TEST_F(InternalServiceTest, HandsMessagesToTheBugCaptureManagerAsTheyAre)
             harness.service->handleEventForVorp({{"Haptic_Active_Hardware_Time_Seconds", seconds}}, playbackOfTheDSP,
                                                 gimbo, player.session(42), "player");
         });
-    ASSERT_THAT(platform.bugCapture.snapshots(), SizeIs(1)) << "the second says something else than the first";
+    ASSERT_THAT(platform.bugCapture.snapshots(), SizeIs(1)) << "the second report differs from the first";
     const Dictionary& signature = platform.bugCapture.snapshots()[0].signature;
     EXPECT_EQ(*signature.find("type"), Value("haptics"));
     EXPECT_EQ(*signature.find("subType"), Value("DSP_Playback"));

@@ -1,5 +1,6 @@
-// The linker has the program call these in place of malloc and its like: they count what those really gave, a count a
-// thread, so that other threads do not disturb it. Operator new is the program's own, so that it is counted as well.
+// The linker makes the program call these functions in place of malloc and its like. They count the real sizes,
+// separately for each thread, so that other threads do not disturb the count. Operator new is the program's own, so
+// that it is counted as well.
 #include "session/AllocatedBytes.h"
 
 #include "support/Sanitizers.h"
@@ -22,7 +23,7 @@ void count(std::ptrdiff_t more) noexcept
 
 std::ptrdiff_t bytesOf(void* memory) noexcept
 {
-    return static_cast<std::ptrdiff_t>(::malloc_usable_size(memory)); // of null pointer 0
+    return static_cast<std::ptrdiff_t>(::malloc_usable_size(memory)); // 0 for null
 }
 
 } // namespace
@@ -42,7 +43,7 @@ std::ptrdiff_t mostAllocatedBytes() noexcept
     return mostBytes;
 }
 
-// NOLINTBEGIN(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp): the names that the linker gives them
+// NOLINTBEGIN(bugprone-reserved-identifier,cert-dcl37-c,cert-dcl51-cpp): the linker chooses these names
 extern "C" {
 
 void* __real_malloc(std::size_t size);

@@ -1,12 +1,13 @@
-// How much memory a thread has, and had at most, so that a test can say what something takes while it is made.
+// How much memory a thread has and has had at most, so that a test can check the memory that an object takes while it
+// is made.
 #pragma once
 
 #include <cstddef>
 
-// What the calling thread allocated and nobody released yet, less what it released of others': by the program itself,
-// not by the libraries that it shares.
+// The bytes that the program itself, without shared libraries, allocated on this thread and that are not released yet,
+// less the bytes of other threads that it released.
 [[nodiscard]] std::ptrdiff_t allocatedBytes() noexcept;
-// Forgets the most there was.
+// Sets the maximum to the present bytes.
 void forgetMostAllocatedBytes() noexcept;
-// The most since then.
+// The maximum since then.
 [[nodiscard]] std::ptrdiff_t mostAllocatedBytes() noexcept;

@@ -1,4 +1,4 @@
-// Which entries the reader gives, and that one which is as before is given as the item that it was before.
+// Which entries the reader gives, and that an unchanged entry is the same item as before.
 #include "session/EntryReader.h"
 
 #include "session/GeneratedMessages.h"
@@ -36,7 +36,7 @@ public:
     }
 
     [[nodiscard]] const std::vector<std::vector<Entry>>& payloads() const { return payloads_; }
-    // The keys whose notes were asked for.
+    // The keys for which the reader asked for a note.
     [[nodiscard]] const std::vector<std::string>& learnt() const { return learnt_; }
     [[nodiscard]] std::vector<std::string> texts() const
     {
@@ -103,7 +103,7 @@ TEST(EntryReader, ReadsAPayloadThatTheStoreKeepsUnencoded)
     EXPECT_TRUE(reading.payloads()[1][1].item.isSameAs(reading.payloads()[0][1].item));
 }
 
-// Beyond the places that the reader remembers, too.
+// Also with more entries than the reader remembers.
 TEST(EntryReader, ReadsPayloadsOfManyEntries)
 {
     Messages payloads;

@@ -1,4 +1,4 @@
-// Compiled once for all tests: the library's templates take longer than a test that uses them.
+// Compiled once for all tests, because the library's templates take longer to compile than a test that uses them.
 #include "session/GeneratedMessages.h"
 
 #include <cstdint>
@@ -31,14 +31,14 @@ const std::vector<foundation::Value>& oddValues()
     return values;
 }
 
-// One of these, and now and then an odd one.
+// One of these, and now and then an unusual one.
 rc::Gen<foundation::Value> valueAmong(std::vector<foundation::Value> usual)
 {
     return rc::gen::weightedOneOf<foundation::Value>(
         {{9, rc::gen::elementOf(std::move(usual))}, {1, rc::gen::elementOf(oddValues())}});
 }
 
-// How the time of a message is written, and how much later than the one before it is.
+// The form of a message's time, and its distance from the message before.
 struct Time {
     enum class Form { None, Double, Float, Integer, Text, Odd };
     Form form;

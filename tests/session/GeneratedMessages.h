@@ -1,5 +1,5 @@
-// Payloads that RapidCheck makes up, as players send them and as they should not: keys missing, values of every wrong
-// type, booleans sent as numbers, times that stand still, fall, or are no times.
+// Payloads that RapidCheck makes, both as players send them and as they should not: missing keys, values of every wrong
+// type, booleans sent as numbers, times that stand still, decrease, or are not times.
 #pragma once
 
 #include "session/StoredMessages.h"
@@ -10,8 +10,8 @@
 
 namespace generated {
 
-// So many of them, each with the clock running over it: a property runs a hundred times, and thousands of stores are to
-// be tried.
+// So many payloads, each with a time from the running clock. A property runs a hundred times, and thousands of stores
+// are to be tried.
 rc::Gen<std::vector<Messages>> manyPayloads(std::size_t count);
 
 } // namespace generated

@@ -1,4 +1,4 @@
-// What a session does with a message: normalise it, compare it with the one before of its kind, record it.
+// A session's handling of a message: it normalises it, compares it with the previous one of its kind, and records it.
 #include "session/KestoReportingSession.h"
 #include "support/TestPlatform.h"
 
@@ -45,7 +45,7 @@ protected:
     {
         session->sendMessage(message, category, type, nullptr);
     }
-    // What the session recorded, which sets the tag itself.
+    // The recorded payload; the session sets the tag itself.
     [[nodiscard]] std::vector<Dictionary> recorded() const { return session->nestedAggregatedPayloadData().value(); }
     [[nodiscard]] std::vector<std::string> identifiers() const
     {
@@ -344,7 +344,7 @@ TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
 
 class SingleMessageTest : public testing::Test {
 protected:
-    // Sends one and tells the delta that the log shows.
+    // Sends one message, and returns the delta that the log shows.
     int send(AudioServiceType serviceType)
     {
         platform.log.clear();

@@ -44,7 +44,7 @@ protected:
         send(30, {{"PomoSessionVolume", 0.75}});
         send(100, {{"session_output_running", false}});
     }
-    // The identifiers of what the session holds.
+    // The identifiers of the messages in the session.
     [[nodiscard]] std::vector<std::string> identifiers() const
     {
         std::vector<std::string> identifiers;
@@ -52,7 +52,7 @@ protected:
             identifiers.emplace_back(message.begin()->key.view());
         return identifiers;
     }
-    // Stops, and remembers what happened where it can be seen from outside.
+    // Stops, and records the effects that are visible from outside.
     std::vector<std::string> stop()
     {
         std::vector<std::string> steps;
@@ -157,7 +157,7 @@ TEST_F(SessionStop, HandsVolumeEventsToTheBridgeAsTheyWereMade)
               R"("play_seconds":70,"spatial-audio-accessory-feature":false,"spatializationEnabled":false,)"
               R"("ringerstate":false,"mChannelsPerFrame":-1,"play_secondsBucketed":"60","msgidx":2,"msgcnt":2})");
     EXPECT_EQ(platform.analytics.payloads("com.quarn.longformaudio.Volume.Summary"), events);
-    EXPECT_THAT(platform.analytics.sent(), SizeIs(4)) << "and the bridge hears of nothing else";
+    EXPECT_THAT(platform.analytics.sent(), SizeIs(4)) << "the bridge gets nothing else";
 }
 
 TEST_F(SessionStop, PutsVolumeEventsIntoTheFileButNotTheSummary)

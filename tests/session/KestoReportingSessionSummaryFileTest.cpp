@@ -1,4 +1,4 @@
-// The summary file: where it is, what it is called, what it holds, and what is said when it cannot be.
+// The summary file: its place, its name, its content, and the log line when it cannot be written.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
 #include "support/ParseJson.h"
@@ -35,7 +35,7 @@ Value parse(const std::string& text)
     return value.value_or(Value());
 }
 
-// The process's time zone, until it is gone.
+// Sets the process's time zone as long as it exists.
 class TimeZone {
 public:
     explicit TimeZone(const char* zone) { set(zone); }
@@ -63,7 +63,7 @@ protected:
 
     void record(const Dictionary& message) { session->sendMessage(message, playback, AudioEventTypeError, nullptr); }
 
-    // Writes, and gives back the name and the text of the one file that is there then.
+    // Writes the file, and returns the name and text of the only file.
     std::pair<std::string, std::string> write()
     {
         platform.log.clear();
@@ -76,7 +76,7 @@ protected:
         return {path.filename(), text};
     }
 
-    // The name of the file for such an application.
+    // The name of the file for that application.
     std::string nameFor(const Value& application)
     {
         session->setConfiguration(Dictionary{{"HostApplicationDisplayID", application}});
@@ -91,7 +91,7 @@ protected:
         std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
 };
 
-// --- when there is one
+// --- when it is written
 
 TEST_F(SummaryFile, IsNoneWithoutMessages)
 {
@@ -133,7 +133,7 @@ TEST(SummaryFileOnCustomerBuilds, IsNone)
     EXPECT_THAT(platform.fileSystem.directories, IsEmpty());
 }
 
-// --- where it is
+// --- its place
 
 TEST_F(SummaryFile, IsInADirectoryForEverybody)
 {
@@ -177,7 +177,7 @@ TEST_F(SummaryFile, LeavesThoseOfOtherSecondsApplicationsAndServicesAlone)
     EXPECT_THAT(platform.fileSystem.files, SizeIs(4));
 }
 
-// --- what it is called
+// --- its name
 
 TEST_F(SummaryFile, IsCalledAfterLocalTimeApplicationAndService)
 {
@@ -235,7 +235,7 @@ TEST_F(SummaryFile, IsCalledByAsMuchOfALongNameAsFileSystemsTake)
     EXPECT_EQ(nameFor(fits + "y"), nameFor(fits));
     EXPECT_EQ(nameFor(std::string(10'000, 'x')), nameFor(fits));
     session->setServiceType(11);
-    EXPECT_EQ(nameFor(std::string(10'000, 'x')).size(), longestName) << "a shorter service leaves more";
+    EXPECT_EQ(nameFor(std::string(10'000, 'x')).size(), longestName) << "a shorter service name leaves more room";
 }
 
 TEST_F(SummaryFile, CutsALongNameBetweenCharacters)
@@ -253,7 +253,7 @@ TEST_F(SummaryFile, CutsALongNameBetweenCharacters)
         }
 }
 
-// --- how many there are
+// --- the number of files
 
 TEST_F(SummaryFile, IsOneOfAsManyAsAreKept)
 {
@@ -290,7 +290,7 @@ TEST_F(SummaryFile, IsNotCountedWhenItWasNotWritten)
     EXPECT_THAT(platform.fileSystem.keptWithin, IsEmpty());
 }
 
-// --- what it holds
+// --- its content
 
 TEST_F(SummaryFile, HoldsTheMessagesOneMemberALine)
 {
@@ -372,7 +372,7 @@ RC_GTEST_PROP(SummaryFileOfAnyStore, SaysToAnotherReaderWhatTheStoreHolds, ())
     }
 }
 
-// --- what can go wrong
+// --- failures
 
 constexpr std::string_view path =
     "/diagnostics/Audio/Reporting/20260101-000000+0000-kesto-org.player-longformaudio.json";
@@ -386,7 +386,7 @@ TEST_F(SummaryFile, IsEmptyWhenAValueCannotBeSaidInJson)
         session->setServiceType(7);
         session->setConfiguration(Dictionary{{"HostApplicationDisplayID", "org.player"}});
         session->start();
-        record({{"before", std::string(200'000, 'x')}}); // more than is written at once
+        record({{"before", std::string(200'000, 'x')}}); // more than one piece
         record({{"a", 1}, {"impossible", impossible}, {"after", true}, {"c", foundation::Array{1}}});
         record({{"after", Dictionary{{"a", true}}}});
         platform.fileSystem.files.clear();
@@ -400,7 +400,7 @@ TEST_F(SummaryFile, IsEmptyWhenAValueCannotBeSaidInJson)
 
 TEST_F(SummaryFile, IsWrittenAlthoughItsDirectoryCouldNotBeMadeAndThatIsSaidTwice)
 {
-    platform.fileSystem.directories = {{"/diagnostics/Audio/Reporting", 0777}}; // which is there, all the same
+    platform.fileSystem.directories = {{"/diagnostics/Audio/Reporting", 0777}}; // the folder nevertheless exists
     platform.fileSystem.directoryError = std::make_error_code(std::errc::permission_denied);
     record({{"a", 1}});
     EXPECT_THAT(write().second, StartsWith("["));

@@ -1,4 +1,4 @@
-// The summary event: every value of every key in one dictionary, and what becomes of it.
+// The summary event: every value of every key, in one dictionary, and its way to the analytics service.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
 #include "session/NaiveAggregation.h"
@@ -26,10 +26,10 @@ protected:
         session->start();
     }
 
-    // As an error, so that nothing is dropped for being repeated. The session adds "audiotag".
+    // Records it as an error, because an error is recorded even if it repeats. The session adds "audiotag".
     void record(const Dictionary& message) { session->sendMessage(message, playback, AudioEventTypeError, nullptr); }
 
-    // The summary's entries as text, without those that every summary has.
+    // The summary's entries as text, except those that every summary has.
     std::string summary()
     {
         const auto event = session->createSummaryEventForSession();
@@ -164,9 +164,9 @@ TEST(SummaryOnCustomerBuilds, IsMadeAndRecordedWithoutTimeStamps)
     platform.traceEmitter.setObserver(nullptr);
 }
 
-// --- and what it costs
+// --- its cost
 
-// A byte of the store may be six characters of the summary.
+// One byte in the store may be six characters of the summary.
 TEST(SummaryOfManyValues, IsLostWhenTheBudgetHasNoRoomForIt)
 {
     support::TestPlatform platform;
@@ -179,7 +179,7 @@ TEST(SummaryOfManyValues, IsLostWhenTheBudgetHasNoRoomForIt)
     EXPECT_THAT(*session->nestedAggregatedPayloadData(), SizeIs(2));
     const std::size_t taken = budget->taken();
     EXPECT_EQ(session->createSummaryEventForSession(), std::nullopt);
-    EXPECT_EQ(budget->taken(), taken) << "what was gathered is paid back";
+    EXPECT_EQ(budget->taken(), taken) << "the memory for the texts is paid back";
 
     platform.log.clear();
     session->stop(platform.turn);
@@ -256,7 +256,7 @@ RC_GTEST_PROP(SummaryOfAnyStore, IsWhatItsDefinitionMakesOfIt, ())
     }
 }
 
-// More kinds of messages, and more entries in each, than are remembered from one message to the next.
+// More kinds of messages, with more entries, than the session remembers.
 TEST_F(Summary, IsMadeOfManyKindsOfLongMessages)
 {
     constexpr int kinds = 20;

@@ -1,4 +1,4 @@
-// A session's life: what it is made with, how its configuration grows, and how a run begins and ends.
+// A session's life: its initial state, its growing configuration, and the beginning and end of a run.
 #include "session/KestoReportingSession.h"
 #include "foundation/cbor/Cbor.h"
 #include "support/TestPlatform.h"
@@ -35,7 +35,7 @@ protected:
         std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7, 8});
 };
 
-// --- making and letting go
+// --- making and destroying
 
 TEST_F(SessionTest, IsMadeWithItsIdentityAndNothingElse)
 {
@@ -275,7 +275,7 @@ TEST_F(SessionTest, PaysForItsConfiguration)
     session->setConfiguration(configuration);
     EXPECT_EQ(budget->taken(), configuration.roughBytes());
     session->setConfiguration(configuration);
-    EXPECT_EQ(budget->taken(), configuration.roughBytes()) << "for what it holds, not for what it was told";
+    EXPECT_EQ(budget->taken(), configuration.roughBytes()) << "for its content, not for the given entries";
 
     forget();
     other->setConfiguration(configuration);
@@ -322,7 +322,7 @@ TEST_F(SessionTest, PaysForTheDriversSnapshot)
     EXPECT_EQ(budget->taken(), 0U);
 }
 
-// --- the trace type that only in-process code can hand in
+// --- the trace type that only in-process code can pass
 
 TEST_F(SessionTest, TellsTheTraceTypeConstantFromEqualText)
 {

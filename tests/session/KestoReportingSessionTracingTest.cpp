@@ -1,4 +1,4 @@
-// The trace of a session: under which conditions it starts and stops, in which place, and what becomes of it.
+// The trace of a session: when it starts and stops, on which thread, and its results.
 #include "session/KestoReportingSession.h"
 #include "support/TestPlatform.h"
 #include "tracing/TraceParams.h"
@@ -53,7 +53,7 @@ protected:
     }
     [[nodiscard]] std::size_t tracesStarted() const { return platform.kernelTrace.sessions().size(); }
     [[nodiscard]] std::size_t filesWritten() const { return platform.performanceWriter.files().size(); }
-    // Of the session, nothing else.
+    // The log lines of sessions alone.
     [[nodiscard]] std::vector<support::LogLine> lines() const { return platform.log.lines("kerr"); }
     void expectNoTraceIsStarted()
     {
@@ -68,7 +68,7 @@ protected:
         EXPECT_EQ(filesWritten(), 0U);
     }
 
-    std::uint64_t now = 1000; // by the kernel's time
+    std::uint64_t now = 1000; // on the kernel's clock
     support::TestPlatform platform;
     std::shared_ptr<KestoReportingSession> session =
         std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
@@ -359,7 +359,7 @@ TEST_F(SessionTracing, RunsAnewInEveryRunOfTheSession)
 
 class SessionTracingThatIsNotStopped : public SessionTracing {
 protected:
-    // It goes on behind the session's stop, and behind its next start.
+    // It goes on after the session's stop, and after its next start.
     void expectItGoesOn()
     {
         for (int run = 0; run < 2; ++run) {

@@ -1,4 +1,4 @@
-// Volume events: which stretches of playing become one, what it says, and what is logged about it.
+// Volume events: which stretches of playing become events, their content, and their log lines.
 #include "session/AllocatedBytes.h"
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
@@ -22,7 +22,7 @@ using testing::SizeIs;
 constexpr double nan = std::numeric_limits<double>::quiet_NaN();
 constexpr double infinity = std::numeric_limits<double>::infinity();
 
-// A payload of that time with these entries.
+// A payload at that time with these entries.
 Dictionary at(const Value& time, const Dictionary& entries)
 {
     return Dictionary{{"kestoreporting_timestamp", time}}.mergedWith(entries);
@@ -62,7 +62,7 @@ protected:
     support::TestPlatform platform;
 };
 
-// --- what an event says
+// --- the content of an event
 
 TEST_F(SessionVolumeEvents, SayWhatWasPlayedHowInThirteenEntriesInOrder)
 {
@@ -215,7 +215,7 @@ TEST_F(SessionVolumeEvents, EndWithTheSession)
 {
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"session_duration", 10}})}), ElementsAre("10"));
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"session_duration", Value()}})}), ElementsAre("10"))
-        << "whatever the duration is";
+        << "for any duration";
 }
 
 TEST_F(SessionVolumeEvents, EndWithTheSessionEvenWhenOutputIsSaidToRun)
@@ -227,7 +227,7 @@ TEST_F(SessionVolumeEvents, EndWithTheSessionEvenWhenOutputIsSaidToRun)
 
 TEST_F(SessionVolumeEvents, CountFromZeroAfterTheEndOfASessionThatNeverStopped)
 {
-    // The end clears the begin of the stretch, but what the state knows is still that output runs.
+    // The end clears the begin of the stretch, but in the state output still runs.
     EXPECT_THAT(playTimes({startAt(100), at(110, {{"session_duration", 10}}), startAt(120), stopAt(130)}),
                 ElementsAre("10", "130"));
     EXPECT_THAT(playTimes({startAt(100), at(110, {{"session_duration", 10}}), at(115, {{"session_duration", 15}})}),
@@ -302,7 +302,7 @@ TEST_F(SessionVolumeEvents, CountTheNextStretchFromTheChangeEvenWhenTheOneBefore
 
 TEST_F(SessionVolumeEvents, TakeABurstOfSwitchesForOneMessage)
 {
-    // On and off within the pause: nothing changed, and the burst's time is that of its last message.
+    // The feature goes on and off within the pause: nothing changed, and the burst's time is that of its last message.
     EXPECT_THAT(playTimes({startAt(0), at(10, {{"spatializationEnabled", true}}),
                            at(11, {{"spatializationEnabled", false}}), stopAt(30)}),
                 ElementsAre("30"));
@@ -316,7 +316,8 @@ TEST_F(SessionVolumeEvents, TakeABurstOfSwitchesForOneMessage)
 
 TEST_F(SessionVolumeEvents, SeeABurstBeforeWhatCameBetweenItsMessages)
 {
-    // The switch that comes at 21 belongs to the burst of 20 and is seen there: output stops before the volume changes.
+    // The switch at 21 belongs to the burst that begins at 20, and takes effect there: output stops before the volume
+    // changes.
     const auto events =
         create({startAt(0), at(20, {{"spatial-audio-accessory-feature", true}}), at(20.5, {{"PomoSessionVolume", 1}}),
                 at(21, {{"spatializationEnabled", true}, {"session_output_running", false}})});
@@ -416,7 +417,7 @@ TEST_F(SessionVolumeEvents, CarryValuesOfTheWrongTypeAsTheyAre)
         EXPECT_EQ(*events[0].find(key), value) << key.view();
 }
 
-// --- what is logged
+// --- log lines
 
 TEST_F(SessionVolumeEvents, SayInTheLogWhatTheyAddAndSkip)
 {
@@ -503,7 +504,7 @@ TEST_F(SessionVolumeEvents, ComeFromABurstOfHundredsOfThousandsOfMessages)
     EXPECT_THAT(playTimes(payloads), ElementsAre("1000"));
 }
 
-// --- and what they cost
+// --- the cost
 
 TEST_F(SessionVolumeEvents, ShareWhatAClientSaidOnce)
 {
@@ -521,7 +522,7 @@ TEST_F(SessionVolumeEvents, ShareWhatAClientSaidOnce)
     EXPECT_EQ(values(events, "ringerstate").back(), "1");
 }
 
-// Each would be written to the store and twice to the disk.
+// Each event would be written to the store, and twice to the disk.
 TEST_F(SessionVolumeEvents, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
 {
     constexpr std::size_t size = std::size_t{1} << 20;
@@ -533,7 +534,7 @@ TEST_F(SessionVolumeEvents, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
     payloads.push_back(stopAt(changes + 2));
     const Messages events = create(payloads);
     const std::size_t fit = KestoReportingSession::mostVolumeEventBytes / size - 1;
-    ASSERT_THAT(events, SizeIs(fit + 1)) << "a small one has room still";
+    ASSERT_THAT(events, SizeIs(fit + 1)) << "a small event still has room";
     EXPECT_EQ(*events.back().find("active_devices"), Value("small"));
     EXPECT_EQ(values(events, "msgidx").back(), std::to_string(fit + 1));
     EXPECT_EQ(values(events, "msgcnt").front(), std::to_string(fit + 1));
@@ -545,7 +546,7 @@ TEST_F(SessionVolumeEvents, AreLostWhenTogetherTheyWouldTakeFarTooMuch)
                     .Times(1));
 }
 
-// Half a volume each second, and another half the next.
+// One half of a volume each second, and the other half in the next.
 std::unique_ptr<session::MessageStore> storeOfVolumeChanges(int changes)
 {
     Messages payloads{startAt(0)};
@@ -554,7 +555,7 @@ std::unique_ptr<session::MessageStore> storeOfVolumeChanges(int changes)
     return storeOf(payloads);
 }
 
-// Makes the events, and sees that they are paid for with what they take, or a fifth more.
+// Makes the events, and checks that the paid bytes are those that they take, or at most a fifth more.
 void expectToPayForWhatTheyTake(const session::MessageStore& store, std::size_t count)
 {
     session::StorageShare share(session::StorageBudget::service());
@@ -640,7 +641,7 @@ TEST_F(SessionVolumeEvents, AreLostWhenTheBudgetHasNoRoomForThem)
             .Times(1));
 }
 
-// Only one session ends at a time, so that a few take nothing from anybody.
+// Only one session ends at a time, so a few events take memory from no other client.
 TEST_F(SessionVolumeEvents, AreThereInSmallNumbersEvenWhenTheBudgetIsUsedUp)
 {
     session::StorageShare share(std::make_shared<session::StorageBudget>(0));

@@ -1,5 +1,5 @@
-// The message store against its definition: a list of identifiers and payloads in which the last message of a kind
-// is found by walking back from the end. And what hostile messages cost it.
+// The message store against its definition: a list of identifiers and payloads, searched from the end for the last
+// message of a kind. And what hostile messages cost.
 #include "session/MessageStore.h"
 #include "foundation/cbor/Cbor.h"
 #include "session/AllocatedBytes.h"
@@ -37,7 +37,7 @@ std::vector<Entry> entries(const session::MessageStore& store)
     return entries;
 }
 
-// The definition, word by word and as slow as it is.
+// The definition, word by word, however slow.
 class NaiveStore {
 public:
     Outcome record(AudioEventCategory category, AudioEventType type, const Dictionary& payload)
@@ -72,7 +72,7 @@ private:
     }
 };
 
-// Values that meet often, of every kind that a client can send.
+// Values that often repeat, of every kind that a client can send.
 rc::Gen<Value> someValue()
 {
     return rc::gen::element<Value>(Value(0), Value(1), Value(1.0), Value(true), Value(-1), Value(0.5F), Value(0.5),
@@ -98,7 +98,7 @@ rc::Gen<Dictionary> somePayload()
 
 RC_GTEST_PROP(MessageStore, RecordsWhatItsDefinitionRecords, ())
 {
-    // Numbers that share their names (0 and 19, 0 and 16) are one kind; 11 and 6 are errors; DSP_Error is none.
+    // Numbers with the same names (0 and 19, 0 and 16) are one kind; 11 and 6 are errors; DSP_Error is not.
     const auto category = rc::gen::element<AudioEventCategory>(0, 4, 11, 14, 16, 0x1000000B, 0x00030004, 0x00050004);
     const auto type = rc::gen::element<AudioEventType>(0, 1, 6, 11, 19, 65535);
     const auto payloads = *rc::gen::resize(4, rc::gen::container<std::vector<Dictionary>>(3, somePayload()));
@@ -181,8 +181,8 @@ TEST(MessageStore, RecordsWhatIsNoNumberEachTimeSinceItEqualsNothing)
     EXPECT_EQ(store.record(4, 1, notANumber()), Outcome::Recorded);
 }
 
-// What is no number equals nothing, itself neither: wherever it stands, however large the rest is, and when it is the
-// very same object, as it is of a message that goes to one session twice.
+// NaN equals nothing, not even itself: at any place, in a message of any size, and even in the same object, as when one
+// message goes to one session twice.
 TEST(MessageStore, NeverTakesAPayloadThatHoldsWhatIsNoNumberForARepetition)
 {
     const Value nan = std::numeric_limits<double>::quiet_NaN();
@@ -286,7 +286,7 @@ TEST(MessageStore, LosesMessagesWhenItsBudgetIsUsedUpAndRecordsAgainWhenThereIsR
     session::MessageStore store(budget);
     EXPECT_EQ(store.record(4, 1, {{"a", 1}}), Outcome::Full);
     EXPECT_TRUE(store.empty());
-    EXPECT_EQ(store.counts(), Dictionary()) << "a kind of which nothing was recorded has no count";
+    EXPECT_EQ(store.counts(), Dictionary()) << "a kind without recorded messages has no count";
 
     budget->giveBack(4096);
     EXPECT_EQ(store.record(4, 1, {{"a", 1}}), Outcome::Recorded);
@@ -327,13 +327,11 @@ TEST(MessageStore, PaysNothingForALargePayloadThatItCannotKeep)
     {
         session::MessageStore store(budget);
         EXPECT_EQ(store.record(4, 1, {{"a", std::string(size - 1, 'x')}}), Outcome::Full);
-        EXPECT_LT(budget->taken(), 500U) << "only its kind is there";
+        EXPECT_LT(budget->taken(), 500U) << "only its kind is paid for";
     }
     EXPECT_EQ(budget->taken(), 0U);
 }
 
-// Every category and type that a client can name apart, of which it could otherwise have as many for nothing as it has
-// sessions.
 TEST(MessageStore, TakesNoMemoryForAMessageThatItsBudgetHasNoRoomFor)
 {
     const auto budget = std::make_shared<session::StorageBudget>(4096);
@@ -366,6 +364,8 @@ TEST(MessageStore, TakesNoMoreForSmallNumbersThanTheirEncoding)
     EXPECT_LT(mostAllocatedBytes() - before, 1'010'000);
 }
 
+// A client can use many categories and types that are different kinds. If kinds cost nothing, it could have all of them
+// in each of its sessions without paying.
 TEST(MessageStore, PaysForEveryKindOfMessage)
 {
     const auto budget = plenty();
@@ -384,7 +384,7 @@ TEST(MessageStore, LosesAMessageOfANewKindWhenItsBudgetHasNoRoomForTheKind)
     const auto budget = std::make_shared<session::StorageBudget>(1024);
     session::MessageStore store(budget);
     EXPECT_EQ(store.record(4, 1, {{"a", 1}}), Outcome::Recorded);
-    EXPECT_EQ(store.record(4, 2, {{"a", 1}}), Outcome::Full) << "though its bytes would fit";
+    EXPECT_EQ(store.record(4, 2, {{"a", 1}}), Outcome::Full) << "even though its bytes would fit";
     EXPECT_EQ(store.record(4, 1, {{"a", 2}}), Outcome::Recorded);
     EXPECT_EQ(store.counts(), (Dictionary{{"Playback_Start", 2}}));
 }
@@ -397,7 +397,7 @@ TEST(MessageStore, PaysForThePayloadThatItKeepsDecoded)
         store.record(4, 1, payload);
         return budget->taken();
     };
-    const Array small(std::vector<Value>(400, Value(Array{0}))); // a kilobyte of it takes many
+    const Array small(std::vector<Value>(400, Value(Array{0}))); // takes many times its kilobyte in memory
     EXPECT_GT(taken({{"a", small}}), taken({{"a", std::string(900, 'x')}}) + Value(small).roughBytes() / 2);
 }
 

@@ -1,4 +1,4 @@
-// Lists of dictionaries, walked from the beginning for every question.
+// Lists of dictionaries, searched from the beginning each time.
 #include "session/NaiveAggregation.h"
 
 #include <cmath>
@@ -28,7 +28,7 @@ double numberOf(const Dictionary& dictionary, const char* key)
     return valueOf(dictionary, key).asDouble();
 }
 
-// A number as it came, and what is none as it is read.
+// A number as it came, and any other value as it is read.
 Number comparable(const Value& value)
 {
     return value.number() ? *value.number() : Number(value.asDouble());

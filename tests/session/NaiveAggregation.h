@@ -1,5 +1,5 @@
-// What a session derives from its messages, written down a second time: step by step on plain lists of dictionaries,
-// as slow as it comes, and with nothing in common with how the service does it.
+// What a session derives from its messages, written a second time: step by step on plain lists of dictionaries, however
+// slow, and without any code of the service's version.
 #pragma once
 
 #include "session/StoredMessages.h"

@@ -1,4 +1,4 @@
-// Bursts: which payloads are folded together, where the folded one stands, and what it holds.
+// Bursts: which payloads are folded together, the place of the folded payload, and its content.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
 #include "session/NaiveAggregation.h"
@@ -20,7 +20,7 @@ Messages combine(const Messages& payloads, std::span<const std::string_view> key
     return KestoReportingSession::combineRapidMessages(*storeOf(payloads), keys, maximumPause);
 }
 
-// A combinable payload, and one that is not.
+// A payload that can be combined, and another that cannot.
 Dictionary flip(const Value& time, const Value& enabled = true)
 {
     return {{"spatializationEnabled", enabled}, {"kestoreporting_timestamp", time}};

@@ -1,4 +1,4 @@
-// No client, and not all of them together, may fill the device's memory with messages.
+// Neither one client nor all of them together may fill the device's memory with messages.
 #include "session/StorageBudget.h"
 
 #include <gtest/gtest.h>
@@ -44,7 +44,7 @@ TEST(StorageBudget, TakesFromTheEnclosingOneToo)
     session::StorageBudget second(80, whole);
     EXPECT_TRUE(first.take(70));
     EXPECT_FALSE(second.take(31)) << "the whole has 30 left";
-    EXPECT_EQ(second.taken(), 0U) << "what the whole refuses is not taken here either";
+    EXPECT_EQ(second.taken(), 0U) << "if the whole refuses bytes, this budget does not take them either";
     EXPECT_TRUE(second.take(30));
     EXPECT_EQ(whole->taken(), 100U);
     first.giveBack(70);
@@ -66,7 +66,7 @@ TEST(StorageShare, GrowsAndShrinksWithWhatItPaysForAndGivesAllBackInTheEnd)
         EXPECT_EQ(share.bytes(), 60U);
         EXPECT_TRUE(share.resize(90));
         EXPECT_FALSE(share.resize(101));
-        EXPECT_EQ(budget->taken(), 90U) << "what is refused changes nothing";
+        EXPECT_EQ(budget->taken(), 90U) << "a refusal changes nothing";
         EXPECT_TRUE(share.resize(20));
         share.shrink(5);
         EXPECT_EQ(share.bytes(), 15U);

@@ -1,4 +1,4 @@
-// Message stores made from plain payloads, and what they hold as plain dictionaries.
+// Message stores made from plain payloads, and their content as plain dictionaries.
 #pragma once
 
 #include "session/MessageStore.h"
@@ -12,7 +12,7 @@
 
 using Messages = std::vector<foundation::Dictionary>;
 
-// A store of these payloads, all of them: as errors, of which none is dropped for being repeated.
+// A store of all these payloads: they are errors, which are recorded even if they repeat.
 inline std::unique_ptr<session::MessageStore> storeOf(const Messages& payloads)
 {
     auto store =
@@ -32,7 +32,7 @@ inline Messages messagesOf(const session::MessageStore& store)
     return messages;
 }
 
-// What tells everything apart: order of entries, kinds of numbers, and values that equal nothing.
+// A text that differs whenever anything differs: order of entries, kinds of numbers, and values that equal nothing.
 inline std::vector<std::string> textsOf(const Messages& dictionaries)
 {
     std::vector<std::string> texts;

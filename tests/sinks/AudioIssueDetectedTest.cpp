@@ -1,4 +1,4 @@
-// The record by itself: its bytes, its text, and its equality.
+// The record alone: its bytes, its text, and its equality.
 #include "sinks/AudioIssueDetected.h"
 
 #include "foundation/GuardedBytes.h"

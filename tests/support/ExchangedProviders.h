@@ -1,4 +1,4 @@
-// A platform like another but for a few providers, for tests and measurements that want some of them real, or slow, or
+// A platform like another except for a few providers: for tests and measurements that want some of them real, slow, or
 // watched.
 #pragma once
 
@@ -9,7 +9,7 @@
 
 namespace support {
 
-// Each of the given providers takes the place of the one that has the same interface.
+// Each given provider replaces the one with the same interface.
 template <typename... Providers>
 [[nodiscard]] platform::Platform withExchanged(const platform::Platform& platform, Providers&... exchanged)
 {

@@ -1,4 +1,4 @@
-// How failures show values: as their text, not as their bytes.
+// Failures show values as their text, not as their bytes.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -20,7 +20,7 @@ inline void PrintTo(const Dictionary& dictionary, std::ostream* out)
     *out << Value(dictionary).text();
 }
 
-// The same for what RapidCheck found.
+// The same for values that RapidCheck found.
 inline void showValue(const Value& value, std::ostream& out)
 {
     PrintTo(value, &out);

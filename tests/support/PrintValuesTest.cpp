@@ -1,4 +1,4 @@
-// What a failure shows of a value.
+// How a failure shows a value.
 #include "support/PrintValues.h"
 
 #include <gtest/gtest.h>

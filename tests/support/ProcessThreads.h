@@ -1,5 +1,4 @@
-// The threads of the process: how many there are, told without surprise by those that a sanitizer keeps for itself, and
-// how nice one of them is.
+// The threads of the process: their number, without those of a sanitizer, and the nice value of one of them.
 #pragma once
 
 #include "support/Sanitizers.h"
@@ -35,7 +34,7 @@ inline std::size_t threadsOfTheProcess()
         std::distance(std::filesystem::directory_iterator("/proc/self/task"), std::filesystem::directory_iterator()));
 }
 
-// The nice value of the thread of that name, beyond the calling one's; nothing when no such thread comes.
+// The nice value of the thread of that name, relative to the calling thread's; nothing if no such thread appears.
 inline std::optional<int> nicenessBeyondOwn(std::string_view name)
 {
     const auto deadline = std::chrono::steady_clock::now() + std::chrono::seconds(20);

@@ -1,4 +1,4 @@
-// Skips tests whose conditions a sanitizer changes.
+// Skips tests that a sanitizer would make fail.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -11,8 +11,8 @@
 #define KESTO_SKIP_WHERE_TYPES_ARE_CHECKED() static_cast<void>(0)
 #endif
 
-// The thread sanitizer makes system calls of its own, and has a thread that does not rest. clang's brings an operator
-// new beside which no other can stand.
+// The thread sanitizer makes its own system calls, and has a thread that never rests. With clang it brings an operator
+// new that a program cannot replace.
 #if defined(__SANITIZE_THREAD__)
 #define KESTO_THREADS_ARE_WATCHED
 #elif defined(__has_feature)
@@ -28,7 +28,7 @@ constexpr bool threadSanitizerWatches = false;
 #define KESTO_SKIP_WHERE_THREADS_ARE_WATCHED() \
     if (!threadSanitizerWatches) {             \
     } else                                     \
-        GTEST_SKIP() << "the thread sanitizer has a thread of its own, that does not rest"
+        GTEST_SKIP() << "the thread sanitizer has its own thread, which never rests"
 
 // The address sanitizer keeps released memory, to find later uses, and the thread sanitizer records the last access to
 // all memory.

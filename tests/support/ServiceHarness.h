@@ -49,7 +49,7 @@ inline Answers answeredOnce(foundation::Array answer)
 }
 inline const Answers unanswered;
 
-// What the work returns, done in a turn of the server queue.
+// Runs the work in a turn of the server queue, and returns its result.
 template <typename Work> auto onServerQueue(FakeWorkQueues& queues, Work work)
 {
     auto inTurn = [&work](platform::Turn& turn) {
@@ -109,9 +109,9 @@ public:
     // `prepare` sets the device up before the service starts.
     explicit ServiceHarness(const std::function<void(TestPlatform&)>& prepare = {});
 
-    // A new process connects and is registered. The log and the trace are cleared of it.
+    // A new process connects and is registered. Clears the log and the trace of it.
     TestClient connect(std::string processName = "player");
-    // Forgets what was logged and traced so far.
+    // Forgets the log and the trace so far.
     void forget();
     // Finds a session in the service, as the delivery of a message does.
     std::shared_ptr<KestoReportingSession> find(std::int64_t reporterID)

@@ -1,4 +1,4 @@
-// A directory for one test, which is removed with everything in it when the test is over; and its files.
+// A directory for one test, and its files; the destructor removes it with everything in it.
 #pragma once
 
 #include <algorithm>

@@ -1,4 +1,4 @@
-// In a file of its own, so that the fakes are compiled once and not for every test that installs them.
+// A separate file, so that the fakes are compiled once and not for every test that installs them.
 #include "support/TestPlatform.h"
 
 namespace support {
@@ -25,7 +25,7 @@ TestPlatform::TestPlatform()
 
 TestPlatform::~TestPlatform()
 {
-    // Waiting items may hold sessions, whose destructors use the platform.
+    // Waiting items may hold sessions, and these use the platform when they are destroyed.
     workQueues.discardAll();
     analytics.clear();
     platform::uninstall();

@@ -1,4 +1,4 @@
-// The whole platform on fakes, installed as long as it lives.
+// The whole platform on fakes, installed as long as this object exists.
 #pragma once
 
 #include "platform/Platform.h"
@@ -28,7 +28,7 @@ public:
     FakeLog log;
     FakeClock clock;
     FakeWorkQueues workQueues{clock};
-    platform::Turn turn; // for what is called from no queue; nothing that it gathers goes anywhere
+    platform::Turn turn; // for calls outside any queue; what it gathers goes nowhere
     FakePreferences preferences;
     FakeFeatureFlags featureFlags;
     FakeDeviceProperties deviceProperties;

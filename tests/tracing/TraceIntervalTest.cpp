@@ -223,7 +223,7 @@ TEST_F(AnyThreadInterval, IsInNanosecondsForEveryUnitOfTheSessionsTime)
     platform.kernelTrace.toNanoseconds = [](std::uint64_t timestamp) { return timestamp * 125 / 3; };
     TraceInterval byThread("mix", beginCode, endCode, true);
     byThread.processTracepoints(*session, Events{begin(1), end(2)});
-    EXPECT_THAT(byThread.getResults(), ElementsAre(83 - 41)) << "each end is converted by itself";
+    EXPECT_THAT(byThread.getResults(), ElementsAre(83 - 41)) << "start and end are converted separately";
     EXPECT_THAT(process({begin(1), end(2)}), ElementsAre(83 - 41));
 }
 

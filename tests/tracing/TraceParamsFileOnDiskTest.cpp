@@ -1,4 +1,4 @@
-// A client may name anything as its file: reading ends at once, with an empty record and a log line.
+// A client may name anything as its file: reading ends without waiting, with an empty record and a log line.
 #include "tracing/TraceParamsParser.h"
 
 #include "foundation/plist/PropertyListWriter.h"

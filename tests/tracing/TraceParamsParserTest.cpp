@@ -207,7 +207,7 @@ TEST_F(TraceParamsFile, HasCodesThatAreScannedAsHexadecimal)
     EXPECT_EQ(code("21 04"), 0x21U) << "up to the first character that is not a digit";
     EXPECT_EQ(code("ffffffff"), 0xFFFFFFFFU);
     EXPECT_EQ(code("0000000000001"), 1U);
-    EXPECT_EQ(code("100000000"), 0xFFFFFFFFU) << "the greatest there is";
+    EXPECT_EQ(code("100000000"), 0xFFFFFFFFU) << "the greatest number";
     for (const std::string_view none : {"", "x", "0x", "-1", "+1", "g1"})
         EXPECT_EQ(code(none), 0U) << none;
     EXPECT_EQ(code(21), 0x21U) << "a number's text";
@@ -240,7 +240,7 @@ TEST_F(TraceParamsFile, HasNamesThatEndAtTheFirstNul)
     const auto params = load(support::binaryPropertyList(
         file(Array{trace(std::string_view("\0A", 2), Array{point(std::string_view("a\0b", 3), "Level", "1")}),
                    trace(std::string_view("B\0C", 3), Array())})));
-    EXPECT_EQ(params->name, "B") << "what ends at once is empty";
+    EXPECT_EQ(params->name, "B") << "text that ends at its beginning is empty";
     EXPECT_EQ(params->traceDataParams.front().name, "a");
     EXPECT_THAT(errors(), ElementsAre(Says(Error, "Description not found in the plist file")));
 }
@@ -274,7 +274,7 @@ TEST_F(TraceParamsFile, NamesTheFirstThingThatIsWrongWithIt)
     EXPECT_EQ(problem(file(Array{trace("A", Array{1})})),
               "Failed to read Trace Point from Trace Points dictionary. Failed with error: it is a number, not a "
               "dictionary");
-    EXPECT_EQ(problem(file(Array{trace("", Array{point("a", "", "")})})), "") << "what can be read all the same";
+    EXPECT_EQ(problem(file(Array{trace("", Array{point("a", "", "")})})), "") << "the rest is still read";
 }
 
 TEST_F(TraceParamsFile, IsTakenFromTheCurrentDirectoryUnlessItsPathIsAbsolute)

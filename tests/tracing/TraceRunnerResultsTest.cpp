@@ -232,7 +232,7 @@ TEST_F(RunnerResultsDeathTest, EndTheProcessAtOnceWithoutWhatIsLeftForItsExit)
         std::atexit([] { std::_Exit(7); });
         trace({5});
     };
-    EXPECT_EXIT(traceWithAnExitHandler(), testing::ExitedWithCode(1), "") << "other threads are at work then";
+    EXPECT_EXIT(traceWithAnExitHandler(), testing::ExitedWithCode(1), "") << "other threads run then";
 }
 
 TEST_F(RunnerResultsDeathTest, EndTheProcessWithStatusOneAfterSayingThatTheDirectoryCannotBeMade)

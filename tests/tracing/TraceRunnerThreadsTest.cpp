@@ -1,6 +1,6 @@
-// Runners on real queues, with a kernel trace whose events come from a thread of its own: whatever happens at once,
-// results hold every interval that was delivered before the end, and nothing is touched by two threads. What two
-// threads must not do shows under the thread sanitizer.
+// Runners on real queues, with a kernel trace that delivers events on its own thread. Whatever the threads do at the
+// same time, results hold every interval that was delivered before the end. The thread sanitizer checks that no two
+// threads use the same data.
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "support/ExchangedProviders.h"
 #include "support/TestPlatform.h"
@@ -17,7 +17,7 @@ constexpr std::uint32_t beginCode = 0x21040010;
 constexpr std::uint32_t endCode = 0x21040014;
 constexpr int cycles = 200;
 
-// A session emits intervals from a thread of its own, from its start to its end.
+// A session emits intervals on its own thread, from its start to its end.
 class EmittingTrace final : public platform::KernelTrace {
 public:
     // The number of events of all sessions that are delivered or on their way to the queue.

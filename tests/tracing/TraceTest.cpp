@@ -218,7 +218,7 @@ TEST(TraceEventsTest, AreLostAndCountedWhenTheMemoryOfAllTracesIsUsedUp)
 
     greedy.reset();
     fill(other, 1);
-    EXPECT_THAT(other.all(), SizeIs(TraceEvents::firstRoom + 1)) << "what is given back is there for others";
+    EXPECT_THAT(other.all(), SizeIs(TraceEvents::firstRoom + 1)) << "freed room is there for others";
     EXPECT_EQ(other.lost(), 1U);
 }
 

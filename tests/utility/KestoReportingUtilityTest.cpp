@@ -232,7 +232,7 @@ RC_GTEST_PROP(NormalisedMessage, IsWhatTheThreeStepsMakeOfIt, (bool isInternalBu
     RC_ASSERT(isRight(message, 1));
     std::vector<Value> others(message.size(), "other");
     const Dictionary later = message.empty() ? message : Dictionary(message.shape(), others);
-    RC_ASSERT(isRight(later, 2)); // of a shape that is known now
+    RC_ASSERT(isRight(later, 2)); // its shape is known now
     platform.deviceProperties.setInternalBuild(!isInternalBuild);
     RC_ASSERT(isRight(later, 2));
 }

@@ -1,5 +1,5 @@
-// Waiting for a flag that another thread sets. The only tests of this folder that take real time, and as little
-// of it as they can: they wait for threads, never for a while.
+// Waiting for a flag that another thread sets. Only these tests of the folder take real time, and as little as
+// possible: they wait for threads, never for a fixed time.
 #include "support/TestPlatform.h"
 #include "support/WatchedThread.h"
 #include "utility/KestoReportingUtility.h"

@@ -93,7 +93,7 @@ TEST(CborError, Malformed)
     // Simple values that have a shorter head.
     for (const std::string_view hex : {"f800", "f814", "f818", "f81f"})
         expectError(hex, CborError::Malformed);
-    // Dates whose content is not a number.
+    // Dates with content that is not a number.
     for (const std::string_view hex : {"c1f5", "c1f6", "c16130", "c1420000", "c180", "c1a0", "c1c100"})
         expectError(hex, CborError::Malformed);
 }
@@ -174,7 +174,7 @@ TEST(CborError, AClaimOfLengthCostsNothing)
         }
 }
 
-// The cheapest element is one byte; what it may cost is a value's 16, and no object behind it.
+// The cheapest element is one byte. It may cost only a value's 16 bytes, without an object.
 TEST(CborError, EmptyContainersCostNoMoreThanTheirPlace)
 {
     constexpr std::size_t count = 1'000'000;

@@ -176,9 +176,9 @@ TEST(Cbor, LaterMessagesOfTheSameKeysHaveTheSameShape)
     EXPECT_EQ(shapeOf("a26161f661626178").get(), definite.get());
     EXPECT_EQ(shapeOf("bf6161f661626178ff").get(), indefinite.get());
     EXPECT_NE(shapeOf("a2616201616102").get(), definite.get());
-    EXPECT_EQ(shapeOf("a2616101616202").get(), definite.get()) << "one that begins otherwise has another place";
+    EXPECT_EQ(shapeOf("a2616101616202").get(), definite.get()) << "a map that begins differently has another place";
     EXPECT_NE(shapeOf("a2616101616302").get(), definite.get());
-    EXPECT_NE(shapeOf("a2616101616202").get(), definite.get()) << "one that begins like it took its place";
+    EXPECT_NE(shapeOf("a2616101616202").get(), definite.get()) << "a map that begins like it took its place";
 }
 
 TEST(Cbor, MapsInsideMapsHaveTheirShapesToo)

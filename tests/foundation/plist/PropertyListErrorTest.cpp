@@ -32,13 +32,13 @@ void expectFailure(std::string_view bytes, PropertyListError error, std::string_
     EXPECT_EQ(read.error().text, text) << bytes;
 }
 
-// Of elements that stand in line 4.
+// The errors in elements on line 4.
 void expectXmlFailure(std::string_view elements, PropertyListError error, const std::string& text)
 {
     expectFailure(xmlDocument(elements), error, "line 4: " + text);
 }
 
-// Of one object.
+// The errors in one object.
 void expectObjectFailure(std::string_view hex, PropertyListError error, const std::string& text)
 {
     expectFailure(BinaryPropertyList{.objects = {fromHex(hex)}}.bytes(), error, "object 0 at byte 8: " + text);
@@ -436,7 +436,7 @@ TEST(BinaryPropertyListErrors, TooManyObjects)
                                                                     "0303"),
                                                             fromHex("5161"), fromHex("5162"), "\x09"}}
                                  .bytes();
-    EXPECT_TRUE(readPropertyList(five, {.objects = 5})) << "one is shared, and counts twice";
+    EXPECT_TRUE(readPropertyList(five, {.objects = 5})) << "a shared object counts twice";
     expectFailure(five, TooManyObjects, "object 0 at byte 8: more than 4 objects", {.objects = 4});
     expectFailure(five, TooManyObjects, "trailer: more than 3 objects", {.objects = 3});
     expectFailure(BinaryPropertyList{.objects = {fromHex("8000")}}.bytes(), TooManyObjects,

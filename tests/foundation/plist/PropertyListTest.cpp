@@ -51,7 +51,7 @@ constexpr std::uint64_t mostUnsigned = std::numeric_limits<std::uint64_t>::max()
 
 // --- files of another program
 
-// Everything that both forms have.
+// All values that both forms have.
 Value everything()
 {
     return Dictionary{
@@ -315,7 +315,7 @@ TEST(BinaryPropertyListObjects, TruthValuesAndNothing)
 TEST(BinaryPropertyListObjects, IntegersOfEveryWidth)
 {
     expectNumber(readObject("1000"), Number(0));
-    expectNumber(readObject("10ff"), Number(255)); // those below 64 bits have no sign
+    expectNumber(readObject("10ff"), Number(255)); // integers below 64 bits have no sign
     expectNumber(readObject("11ffff"), Number(65535));
     expectNumber(readObject("12ffffffff"), Number(4294967295));
     expectNumber(readObject("13ffffffffffffffff"), Number(-1));

@@ -49,14 +49,14 @@ struct BinaryPropertyList {
     }
 };
 
-// A marker, with the length behind it where it does not fit in.
+// A marker, with the length behind it if it does not fit into the marker.
 inline std::string binaryHead(unsigned type, std::uint64_t count)
 {
     const auto marker = [type](std::uint64_t detail) { return std::string(1, static_cast<char>(type << 4 | detail)); };
     return count < 15 ? marker(count) : marker(15) + '\x13' + bigEndian(count, 8);
 }
 
-// UTF-8, which is taken to be valid, in units of 16 bits.
+// UTF-8 text, which must be valid, in units of 16 bits.
 inline std::u16string utf16(std::string_view text)
 {
     std::u16string units;
@@ -75,7 +75,7 @@ inline std::u16string utf16(std::string_view text)
     return units;
 }
 
-// The same as bytes of that order.
+// The same as bytes in that order.
 inline std::string utf16Bytes(std::string_view text, std::endian order)
 {
     std::string bytes;
@@ -87,7 +87,7 @@ inline std::string utf16Bytes(std::string_view text, std::endian order)
     return bytes;
 }
 
-// Every value an object of its own, containers behind their elements.
+// Every value is an object of its own, and containers stand behind their elements.
 class BinaryPropertyListWriter {
 public:
     static std::string write(const foundation::Value& value)

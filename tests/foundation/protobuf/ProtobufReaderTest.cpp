@@ -172,7 +172,7 @@ TEST(ProtobufReader, ReadingAllocatesNothing)
 TEST(ProtobufReader, RefusesTheEndOfAGroupThatDidNotBegin)
 {
     EXPECT_EQ(errorOf("\x0C"s), ProtobufError::UnmatchedEndGroup);
-    EXPECT_EQ(errorOf("\x0B\x14"s), ProtobufError::UnmatchedEndGroup) << "of another number";
+    EXPECT_EQ(errorOf("\x0B\x14"s), ProtobufError::UnmatchedEndGroup) << "the end of another group";
     EXPECT_EQ(errorOf("\x0B\x13\x0C\x14"s), ProtobufError::UnmatchedEndGroup) << "crossed";
     EXPECT_EQ(errorOf("\x0B\x0C\x0C"s), ProtobufError::UnmatchedEndGroup) << "one too many";
 }

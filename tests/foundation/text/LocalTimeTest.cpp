@@ -1,5 +1,5 @@
-// Local time where people live: zones with odd offsets, summer and winter, a device that travels, and moments that no
-// calendar has room for.
+// Local time: zones with odd offsets, summer and winter, a device that travels, and moments that no calendar can
+// express.
 #include "foundation/text/LocalTime.h"
 
 #include <cstdlib>

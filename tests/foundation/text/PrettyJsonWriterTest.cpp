@@ -229,7 +229,7 @@ TEST(PrettyJsonWriter, WritesNothingMoreAfterWhatJsonCannotSay)
                 writer.write(Value(true));
                 writer.endObject();
                 writer.endArray();
-                writer.endArray(); // not even what would be wrong
+                writer.endArray(); // even a wrong call has no effect
                 EXPECT_FALSE(writer.isWhole());
             }
             EXPECT_THAT(pieces.text(), testing::Not(testing::HasSubstr("after")));

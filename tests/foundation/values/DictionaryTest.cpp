@@ -1,4 +1,4 @@
-// Dictionaries compared with their simplest formulation: a list of pairs that is searched from the front.
+// Dictionaries compared with their simplest form: a list of pairs that is searched from the front.
 #include "foundation/values/GeneratedValues.h"
 #include "foundation/values/Value.h"
 
@@ -96,7 +96,7 @@ TEST(Dictionary, FindsAmongTenAndAmongTenThousand)
     }
 }
 
-// The same entries, each key once with the last value in the first place, found by walking.
+// The same entries, found by a search: each key once, with its last value in its first place.
 Dictionary::Entries naivelyFolded(const Dictionary::Entries& entries)
 {
     Dictionary::Entries folded;

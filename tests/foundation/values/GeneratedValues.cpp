@@ -1,4 +1,4 @@
-// Compiled once for all tests: the library's templates take longer than a test that uses them.
+// Compiled once for all tests, because the library's templates take longer to compile than a test that uses them.
 #include "foundation/values/GeneratedValues.h"
 
 #include <cstdint>

@@ -1,4 +1,4 @@
-// JSON text as the store and the tools have it.
+// JSON text in the form of the store and the tools.
 #include "foundation/values/Json.h"
 
 #include "foundation/values/GeneratedValues.h"

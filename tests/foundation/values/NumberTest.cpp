@@ -1,4 +1,4 @@
-// Numbers of every kind at the edges where a careless comparison or conversion goes wrong.
+// Numbers of every kind, at the limits where a careless comparison or conversion is wrong.
 #include "foundation/values/Number.h"
 
 #include <array>
@@ -69,7 +69,7 @@ TEST(Number, IntegersThatADoubleCannotHoldDoNotEqualTheNearestDouble)
 TEST(Number, EqualityHoldsAtTheEndsOfTheIntegerRanges)
 {
     EXPECT_EQ(Number(leastInt64), Number(-0x1p63));
-    EXPECT_NE(Number(mostInt64), Number(0x1p63)); // to which a cast would round it
+    EXPECT_NE(Number(mostInt64), Number(0x1p63)); // a cast would round to this
     EXPECT_EQ(Number(std::uint64_t{1} << 63), Number(0x1p63));
     EXPECT_NE(Number(mostUint64), Number(0x1p64));
     EXPECT_NE(Number(0), Number(0x1p64));
@@ -96,7 +96,7 @@ TEST(Number, NotANumberAndInfinity)
     EXPECT_NE(Number(-infinity), Number(leastInt64));
 }
 
-// The naive formulation: as long as everything fits, `long double` (64 bits of mantissa) holds both sides exactly.
+// The simplest comparison: `long double` (64 bits of mantissa) holds both sides exactly, as long as both fit.
 RC_GTEST_PROP(NumberProperty, EqualityIsThatOfTheExactValues, (std::int64_t integer, double fraction))
 {
     const std::array<Number, 5> numbers{Number(integer), Number(static_cast<std::uint64_t>(integer)), Number(fraction),

@@ -55,7 +55,7 @@ TEST(String, AssignmentKeepsTheObjectAliveAsLongAsSomeoneHasIt)
     EXPECT_EQ(kept.view(), "kept beyond its first owner");
 }
 
-// For the thread sanitizer, and for the address sanitizer to see the last owner let go exactly once.
+// The thread sanitizer checks this, and the address sanitizer checks that the last owner releases exactly once.
 TEST(String, IsSharedByThreads)
 {
     const String shared("shared");
@@ -142,7 +142,7 @@ TEST(Utf8, EachByteThatIsNoCharacterBecomesAQuestionMark)
               "a??b");
     EXPECT_EQ(replaced("cut in two \xC3"), "cut in two ?");
     EXPECT_EQ(replaced("\xED\xA0\x80"), "???") << "half of a surrogate pair";
-    EXPECT_EQ(replaced("\xC0\xAF"), "??") << "longer than it needs to be";
+    EXPECT_EQ(replaced("\xC0\xAF"), "??") << "an overlong form";
 }
 
 TEST(Utf8, CutsBetweenCharacters)
@@ -152,7 +152,7 @@ TEST(Utf8, CutsBetweenCharacters)
     EXPECT_EQ(cutBetweenCharacters("aé", 2), "a");
     EXPECT_EQ(cutBetweenCharacters("aé", 3), "aé");
     EXPECT_EQ(cutBetweenCharacters("😀", 3), "");
-    EXPECT_EQ(cutBetweenCharacters("\x80\x80\x80", 2), "") << "what is no text ends, too";
+    EXPECT_EQ(cutBetweenCharacters("\x80\x80\x80", 2), "") << "the cut ends even in text that is not UTF-8";
     EXPECT_EQ(cutBetweenCharacters("", 0), "");
 }
 

@@ -85,7 +85,7 @@ TEST(Value, AssignmentReplacesAndSurvivesItself)
     const Value& alias = value;
     value = alias;
     EXPECT_EQ(value, Value(Array{"a"}));
-    value = value.array()->values()[0]; // the new value is a part of the old one, which goes
+    value = value.array()->values()[0]; // the new value is a part of the old one, which is destroyed
     EXPECT_EQ(value, Value("a"));
 }
 

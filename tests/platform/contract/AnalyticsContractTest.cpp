@@ -30,11 +30,11 @@ class AnalyticsSubject {
 public:
     virtual ~AnalyticsSubject() = default;
     [[nodiscard]] virtual platform::Analytics& analytics() = 0;
-    // From now on events whose names match the globs are wanted; at first none are. It takes effect a moment later.
+    // From now on events with names that match the globs are wanted; at first none are. It takes effect a moment later.
     virtual void use(const std::string& pattern) = 0;
-    // What the platform does when a turn is over.
+    // Does what the platform does at the end of a turn.
     virtual void end(platform::Turn&) { }
-    // The events that were kept, in order; the service has ended then.
+    // The kept events, in order; this ends the service.
     [[nodiscard]] virtual std::vector<AnalyticsEvent> events() = 0;
 };
 
@@ -48,7 +48,7 @@ private:
     support::FakeAnalytics analytics_;
 };
 
-// The store of Linux, on one keeper of events or another.
+// The store of Linux, on any keeper of events.
 class StoreSubject : public AnalyticsSubject {
 public:
     StoreSubject() { configure(); }
@@ -67,7 +67,7 @@ public:
     void end(platform::Turn& turn) override { store_->endTurn(turn, nullptr); }
     [[nodiscard]] std::vector<AnalyticsEvent> events() override
     {
-        store_.reset(); // which keeps all of them
+        store_.reset(); // it keeps all of them first
         return kept();
     }
 
@@ -196,7 +196,7 @@ TEST_P(AnalyticsContract, BuildsAPayloadOnceAndLetsItsBuilderGo)
     });
     EXPECT_LE(built, 1);
     EXPECT_EQ(subject->events().size(), 1U);
-    EXPECT_EQ(subject->events().size(), 1U) << "however often it is looked at";
+    EXPECT_EQ(subject->events().size(), 1U) << "even if it is read several times";
     EXPECT_EQ(built, 1);
     EXPECT_TRUE(watched.expired());
 }
@@ -207,7 +207,7 @@ TEST_P(AnalyticsContract, DropsAnUnwantedEventWithItsBuilder)
     auto held = std::make_shared<int>(7);
     const std::weak_ptr<int> watched = held;
     subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, "com.quarn.b", [held = std::move(held)] {
-        ADD_FAILURE() << "nobody needs the payload";
+        ADD_FAILURE() << "the service does not need the payload";
         return Dictionary{{"n", *held}};
     });
     EXPECT_TRUE(watched.expired());

@@ -1,5 +1,5 @@
-// The contract of platform/BugCapture.h: what a signature holds, what a caller passes with a request, and when
-// the answer comes.
+// The contract of platform/BugCapture.h: the content of a signature, the data that a caller passes with a request, and
+// the time of the answer.
 #include "platform/contract/Contract.h"
 #include "platform/linux/bugs/LinuxBugCapture.h"
 #include "platform/linux/log/LinuxLog.h"
@@ -105,7 +105,7 @@ protected:
         return subject->capture().makeReporter()->makeSignature("Sonalis", "haptics", "Playback", "Gimbo", "player",
                                                                 triggerThresholdValues);
     }
-    // Requests a snapshot with a reporter of its own, which is destroyed at once.
+    // Requests a snapshot with its own reporter, which is destroyed immediately.
     void request(int number)
     {
         subject->capture().makeReporter()->requestSnapshot(signature(), 0, std::nullopt, std::nullopt,
@@ -182,7 +182,7 @@ TEST_P(BugCaptureContract, KeepsWhatItWasAskedWithAndTheStateOfThatMoment)
     request(2);
     const int askedBeforeWork = timesAsked;
     subject->work();
-    EXPECT_EQ(timesAsked, askedBeforeWork) << "later it is another state";
+    EXPECT_EQ(timesAsked, askedBeforeWork) << "later the state differs";
     EXPECT_EQ(askedBeforeWork, 2);
     EXPECT_THAT(subject->kept(),
                 ElementsAre(Kept{signature(), 2.5, "event", Array{1}, Dictionary{{"asked", 1}}},

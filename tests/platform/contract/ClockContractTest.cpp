@@ -1,4 +1,4 @@
-// The contract of platform/Clock.h: a time of day, and an uptime that only ever grows.
+// The contract of platform/Clock.h: a time of day, and an uptime that never decreases.
 #include "platform/contract/Contract.h"
 #include "platform/linux/process/LinuxClock.h"
 #include "support/fakes/FakeClock.h"
@@ -43,7 +43,7 @@ KESTO_CONTRACT(ClockContract, (provider<ClockSubject, FakeClockSubject>("Fake"))
 
 TEST_P(ClockContract, TellsSecondsSince1970)
 {
-    constexpr double september2001 = 1'000'000'000; // before this was written
+    constexpr double september2001 = 1'000'000'000; // this test is younger
     EXPECT_GE(subject->clock().secondsSince1970(), september2001);
     EXPECT_LT(subject->clock().secondsSince1970(), 10 * september2001) << "and not milliseconds";
 }
@@ -56,7 +56,7 @@ TEST_P(ClockContract, TellsAnUptimeThatBeganAfter1970)
 
 TEST_P(ClockContract, LetsBothTimesPassAlike)
 {
-    constexpr double tolerance = 1; // for a clock that is set right meanwhile
+    constexpr double tolerance = 1; // the clock may be corrected meanwhile
     const double time = subject->clock().secondsSince1970();
     const double uptime = subject->clock().systemUptime();
     subject->letTimePass();

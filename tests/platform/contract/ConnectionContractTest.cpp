@@ -1,5 +1,5 @@
-// The contract of platform/Connection.h: the order of calls and ends, the lifetimes of handlers and callers, when
-// answers leave, and late answers.
+// The contract of platform/Connection.h: the order of calls and ends, the lifetimes of handlers and callers, the time
+// at which answers leave, and late answers.
 #include "platform/contract/Contract.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
 #include "platform/linux/connection/SocketClient.h"
@@ -24,7 +24,7 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
 
-// A call of the tests: a number, and text to make it as large as a test needs it.
+// A call: a number, and text that makes it as large as the test needs.
 Array callOf(int number, std::size_t textLength = 0)
 {
     return {number, std::string(textLength, 'x')};
@@ -44,12 +44,12 @@ std::string answer(int number)
 class ContractPeer {
 public:
     virtual ~ContractPeer() = default;
-    // Makes the calls, all in one go, and does not wait until they are taken.
+    // Makes the calls, all together, and does not wait until they are taken.
     virtual void call(const std::vector<Array>& frames) = 0;
     virtual void close() = 0;
-    // Goes in the middle of a call.
+    // Closes the connection in the middle of a call.
     virtual void breakOff() = 0;
-    // The number of the next answer; nothing when the connection is closed.
+    // The number of the next answer; nothing if the connection is closed.
     [[nodiscard]] virtual std::optional<int> nextAnswer() = 0;
     // Whether an answer has arrived.
     [[nodiscard]] virtual bool hasAnswer() = 0;
@@ -62,11 +62,11 @@ public:
     virtual void listen(platform::ConnectionListenerDelegate& delegate) = 0;
     virtual void stop() = 0;
     [[nodiscard]] virtual std::unique_ptr<ContractPeer> connect() = 0;
-    // The number of the process that the peers are.
+    // The process ID of the peers.
     [[nodiscard]] virtual std::int32_t peerProcess() const = 0;
-    // A queue whose turns end as the service's do.
+    // A queue with the turn-end handler of the service.
     [[nodiscard]] virtual platform::TurnQueue& serverQueue() = 0;
-    // Does what waits, if nobody else does.
+    // Runs waiting items, if no thread does.
     virtual void work() { }
 };
 
@@ -122,7 +122,7 @@ private:
 class LinuxPeer final : public ContractPeer {
 public:
     explicit LinuxPeer(const std::filesystem::path& path) : client_(path) { }
-    ~LinuxPeer() override { ::shutdown(client_.descriptor(), SHUT_RDWR); } // in case that it still writes
+    ~LinuxPeer() override { ::shutdown(client_.descriptor(), SHUT_RDWR); } // it may still be writing
     LinuxPeer(const LinuxPeer&) = delete;
     LinuxPeer& operator=(const LinuxPeer&) = delete;
     void call(const std::vector<Array>& frames) override
@@ -171,7 +171,7 @@ public:
                 send();
         });
         queue_ = queues_.makeTurnQueue("server", {.mayBeHelped = true});
-        // Both ends of every connection are in this process: its limit stays as it is.
+        // Both ends of every connection are in this process, so its limit stays unchanged.
         listener_ =
             platform::LinuxConnectionListener::create(platform::ListeningSocket::bind(path_).value(), log_).value();
     }
@@ -206,13 +206,13 @@ private:
     std::thread thread_;
 };
 
-// What happened on one connection.
+// The record of one connection.
 struct Record {
     std::shared_ptr<Connection> connection;
     std::vector<Connection::Call> calls; // not answered yet
     std::vector<std::string> history; // "call 1", "interrupted", "invalidated"
-    std::set<std::thread::id> threads; // on which it happened
-    // The objects that the handlers hold, one for each.
+    std::set<std::thread::id> threads; // of the entries of `history`
+    // The objects that the handlers hold, one in each handler.
     std::weak_ptr<int> callHandler;
     std::weak_ptr<int> interruptionHandler;
     std::weak_ptr<int> invalidationHandler;
@@ -287,7 +287,7 @@ protected:
     {
         return progress.look([&] { return record.calls.size(); });
     }
-    // Returns when it is delivered.
+    // Returns after the delivery.
     void makeACall(ContractPeer& peer, Record& record)
     {
         const std::size_t before = callsOf(record);
@@ -306,7 +306,7 @@ protected:
     }
 
     bool accepts = true;
-    std::function<Outcome(Record&, const Connection::Call&)> onCall; // on the connection thread, in addition
+    std::function<Outcome(Record&, const Connection::Call&)> onCall; // on the connection thread, after the record
     std::function<void(Record&, std::string_view)> onEnd;
     support::Progress progress;
     std::vector<std::shared_ptr<Record>> records;
@@ -414,7 +414,7 @@ TEST_P(ConnectionContract, SendsWithoutWaitingForAPeerThatDoesNotRead)
 {
     constexpr int count = 100;
     const auto [peer, record] = listenAndConnect();
-    for (int number = 1; number <= count; ++number) // far more than a socket holds
+    for (int number = 1; number <= count; ++number) // far more than a socket can hold
         support::sendAtOnce(*record->connection, support::answerTo({number}, 64 * 1024));
     for (int number = 1; number <= count; ++number)
         ASSERT_EQ(peer->nextAnswer(), number);
@@ -432,7 +432,7 @@ TEST_P(ConnectionContract, ReadsNoMoreFromAPeerWhoseUnansweredCallsAreTooLarge)
         calls.push_back(callOf(number, large));
     peer->call(calls);
     std::size_t delivered = 0;
-    for (int quiet = 0; quiet < 20; ++quiet) { // calls of another one, meanwhile
+    for (int quiet = 0; quiet < 20; ++quiet) { // meanwhile another connection makes calls
         makeACall(*other, *otherRecord);
         if (const std::size_t now = callsOf(*record); std::exchange(delivered, now) != now)
             quiet = 0;
@@ -459,7 +459,7 @@ TEST_P(ConnectionContract, IsInvalidatedOnceWhenThePeerClosesIt)
     peer->call({callOf(1)});
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
-    subject->stop(); // nothing can come afterwards
+    subject->stop(); // nothing can follow
     EXPECT_THAT(record->history, ElementsAre("call 1", "invalidated"));
 }
 

@@ -18,7 +18,7 @@
 
 namespace contract {
 
-// One of those on which a suite runs.
+// One of the providers on which a suite runs.
 template <typename Subject> struct Provider {
     std::string_view name;
     std::unique_ptr<Subject> (*make)();

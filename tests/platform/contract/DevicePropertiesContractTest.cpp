@@ -1,4 +1,4 @@
-// The contract of platform/DeviceProperties.h: a property is true, false, or not there.
+// The contract of platform/DeviceProperties.h: a property is true, false, or missing.
 #include "platform/contract/Contract.h"
 #include "platform/linux/settings/LinuxDeviceProperties.h"
 #include "support/TemporaryDirectory.h"

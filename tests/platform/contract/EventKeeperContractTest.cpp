@@ -1,5 +1,5 @@
-// The contract of platform/linux/store/EventKeeper.h: what is kept lasts in its order, and what is too old or too much
-// goes.
+// The contract of platform/linux/store/EventKeeper.h: kept events stay in their order, and those that are too old or
+// too many are removed.
 #include "platform/contract/Contract.h"
 #include "platform/linux/store/EventWriter.h"
 #include "platform/linux/store/ManualClock.h"
@@ -24,10 +24,10 @@ constexpr double secondsADay = 86400;
 class EventKeeperSubject {
 public:
     virtual ~EventKeeperSubject() = default;
-    // Made anew after `close`, in the same place.
+    // The keeper; after `close` it is made again in the same place.
     [[nodiscard]] virtual platform::EventKeeper& keeper() = 0;
     virtual void close() = 0;
-    // The payloads of the events that lie there now, in their order.
+    // The payloads of the events in that place, in their order.
     [[nodiscard]] virtual std::vector<std::string> payloads() = 0;
 
     support::ManualClock clock;

@@ -1,4 +1,4 @@
-// The contract of platform/FeatureFlags.h: a flag is on when its owner has switched it on, and only then.
+// The contract of platform/FeatureFlags.h: a flag is on only if its owner has switched it on.
 #include "platform/contract/Contract.h"
 #include "platform/linux/settings/LinuxFeatureFlags.h"
 #include "support/TemporaryDirectory.h"

@@ -26,13 +26,13 @@ class FileSystemSubject {
 public:
     virtual ~FileSystemSubject() = default;
     [[nodiscard]] virtual platform::FileSystem& files() = 0;
-    // Of the folder, if there is one.
+    // The permissions of the folder, if it exists.
     [[nodiscard]] virtual std::optional<unsigned> permissionsOf(const fs::path& folder) = 0;
     // The names in the folder, sorted, hidden ones too.
     [[nodiscard]] virtual std::vector<std::string> namesIn(const fs::path& folder) = 0;
-    // The text of a file, if there is one.
+    // The text of a file, if it exists.
     [[nodiscard]] virtual std::optional<std::string> textOf(const fs::path& file) = 0;
-    // A file that another program wrote, outside of the root.
+    // A file of another program, outside the root.
     [[nodiscard]] virtual fs::path writeElsewhere(const std::string& text) = 0;
     // Runs the background work.
     virtual void work() = 0;
@@ -276,7 +276,7 @@ TEST_P(FileSystemContract, KeepsAsManyFilesOfTheKindAsThereMayBe)
     const auto names = subject->namesIn(root);
     EXPECT_LE(std::ranges::count_if(names, isNote), 4);
     EXPECT_THAT(names, Contains("note-5")) << "the newest";
-    EXPECT_THAT(names, Contains("other")) << "which is of no such kind";
+    EXPECT_THAT(names, Contains("other")) << "it is not of this kind";
     EXPECT_THAT(names, Not(Contains("note-1"))) << "the oldest";
 }
 
@@ -325,7 +325,7 @@ TEST_P(FileSystemContract, SaysWhyAFileCannotBeRead)
     EXPECT_EQ(files.readFile(root / "folder", 10).error(), std::errc::invalid_argument);
     ASSERT_FALSE(write(root / "a", "text"));
     EXPECT_EQ(files.readFile(root / std::string("a\0b", 3), 10).error(), std::errc::invalid_argument)
-        << "what stands before the zero is not its name";
+        << "the text before the zero is not its name";
 }
 
 } // namespace

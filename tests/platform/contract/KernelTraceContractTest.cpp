@@ -28,13 +28,13 @@ using testing::IsEmpty;
 class KernelTraceSubject {
 public:
     virtual ~KernelTraceSubject() = default;
-    // The reason if it cannot be tested on this machine.
+    // The reason if this machine cannot test it.
     [[nodiscard]] virtual std::optional<std::string> absence() const { return std::nullopt; }
     [[nodiscard]] virtual platform::KernelTrace& trace() = 0;
     [[nodiscard]] virtual platform::WorkQueues& queues() = 0;
-    // An event happens now.
+    // Emits an event now.
     virtual void emit(std::uint32_t code, const std::array<std::uint64_t, 4>& arguments = {}) = 0;
-    // The system has no trace, from its start on.
+    // From its start on, the system has no trace.
     virtual void takeTraceAway() = 0;
     // Makes existing sessions unable to start; false if the subject cannot do this.
     [[nodiscard]] virtual bool refuseToStart() = 0;
@@ -97,7 +97,7 @@ private:
     platform::TracefsKernelTrace trace_;
 };
 
-// Made before the provider that looks for it.
+// Must be made before the provider that looks for it.
 struct TreeFirst {
     support::TracefsTree tree;
 };
@@ -135,7 +135,7 @@ public:
         emitter_.emit(code, arguments);
     }
     [[nodiscard]] bool refuseToStart() override { return false; }
-    [[nodiscard]] bool lose(std::uint64_t) override { return false; } // that would take a buffer full of them
+    [[nodiscard]] bool lose(std::uint64_t) override { return false; } // it would need a full buffer
 };
 
 // A session and its delivered events.
@@ -151,7 +151,7 @@ public:
     ~TraceListener()
     {
         session.reset();
-        drain(); // what was on its way
+        drain(); // events that were on their way
     }
     TraceListener(const TraceListener&) = delete;
     TraceListener& operator=(const TraceListener&) = delete;
@@ -178,7 +178,7 @@ public:
         return events;
     }
     [[nodiscard]] std::vector<std::uint32_t> codes() { return delivered_.codes(); }
-    // Returns when everything that was on the queue has been run.
+    // Returns when everything on the queue has run.
     void drain()
     {
         support::Progress progress;
@@ -278,7 +278,7 @@ TEST_P(KernelTraceContract, DeliversWhatHappensFromTheStartToTheEnd)
     ASSERT_TRUE(listener.waitForCompletion());
     ASSERT_TRUE(other.waitForCompletion());
     EXPECT_THAT(listener.codes(), ElementsAre(2U, 3U));
-    EXPECT_THAT(other.codes(), ElementsAre(1U, 2U, 3U, 4U)) << "each session by itself";
+    EXPECT_THAT(other.codes(), ElementsAre(1U, 2U, 3U, 4U)) << "each session separately";
 }
 
 TEST_P(KernelTraceContract, DeliversWhileASessionRuns)
@@ -335,9 +335,9 @@ TEST_P(KernelTraceContract, TellsInTheCompletionHandlerHowManyEventsWereLostWhil
     run(false);
     EXPECT_THAT(lost, ElementsAre(0U));
     if (!run(true))
-        GTEST_SKIP() << "nothing is lost here on purpose";
+        GTEST_SKIP() << "this provider cannot lose events on purpose";
     run(false);
-    EXPECT_THAT(lost, ElementsAre(0U, 1840U, 0U)) << "what was lost before is not the last one's";
+    EXPECT_THAT(lost, ElementsAre(0U, 1840U, 0U)) << "earlier losses do not count for the last session";
 }
 
 TEST_P(KernelTraceContract, CompletesASessionOnceHoweverOftenItIsEnded)
@@ -371,7 +371,7 @@ TEST_P(KernelTraceContract, CompletesASessionThatCouldNotBeStartedWhenItIsEnded)
         GTEST_SKIP() << "the kernel does not refuse";
     EXPECT_NE(listener.session->start(listener.queue), 0);
     subject->emit(1);
-    listener.queue->submit([&] { // so that it is ended twice before its completion can run
+    listener.queue->submit([&] { // so that the session is ended twice before its completion can run
         listener.session->end();
         listener.session->end();
     });
@@ -403,7 +403,7 @@ TEST_P(KernelTraceContract, NeverCompletesASessionThatIsDestroyedBefore)
     running.session.reset();
     ended.session->end();
     ended.session.reset();
-    complete.queue->submit([&] { // behind which its completion has to wait
+    complete.queue->submit([&] { // the completion has to wait behind it
         complete.session->end();
         settle();
         complete.session.reset();
@@ -489,7 +489,7 @@ TEST_P(KernelTraceContract, SaysThatASessionHasStartedAlready)
 {
     TraceListener listener(*subject);
     ASSERT_EQ(listener.filter(1, 1), 0);
-    EXPECT_NE(listener.session->start(nullptr), 0) << "without a queue it has not";
+    EXPECT_NE(listener.session->start(nullptr), 0) << "a session without a queue has not started";
     ASSERT_EQ(listener.session->start(listener.queue), 0);
     EXPECT_NE(listener.session->start(listener.queue), 0);
     EXPECT_NE(listener.filter(2, 2), 0);

@@ -1,5 +1,4 @@
-// The contract of platform/Log.h, of the log itself: a threshold for each category, and complete lines, from any
-// thread.
+// The contract of platform/Log.h for a log: a threshold for each category, and complete lines from any thread.
 #include "platform/contract/Contract.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/log/LinuxLog.h"
@@ -23,9 +22,9 @@ using testing::ElementsAre;
 class LogSubject {
 public:
     virtual ~LogSubject() = default;
-    // The log of a process that was started with that general threshold.
+    // The log of a process with that general threshold.
     [[nodiscard]] virtual platform::Log& start(LogLevel threshold) = 0;
-    // The lines so far, once there are so many.
+    // All lines so far, as soon as there are so many.
     [[nodiscard]] virtual std::vector<LogLine> lines(std::size_t count) = 0;
 };
 
@@ -42,7 +41,7 @@ private:
     support::FakeLog log_;
 };
 
-// A socket stands for the journal: a line is a datagram of fields.
+// A socket stands in for the journal: a line is a datagram of fields.
 class LinuxLogSubject final : public LogSubject {
 public:
     LinuxLogSubject()
@@ -58,7 +57,7 @@ public:
         return log_.emplace(platform::LogThresholds::parse(platform::name(threshold)).value(),
                             platform::LinuxLog::Destination{.journalSocket = path_, .descriptor = -1});
     }
-    // A thread reads it, because a real journal is never behind for long.
+    // A thread reads it, because a real journal is never late for long.
     [[nodiscard]] std::vector<LogLine> lines(std::size_t count) override
     {
         EXPECT_TRUE(progress_.waitFor([&] { return lines_.size() >= count; }));
@@ -148,7 +147,7 @@ TEST_P(LogContract, WritesEveryRecord)
 {
     platform::Log& log = subject->start(LogLevel::Error);
     log.write(record("below the threshold", LogLevel::Debug));
-    EXPECT_EQ(subject->lines(1).size(), 1U) << "the threshold is for those who ask before";
+    EXPECT_EQ(subject->lines(1).size(), 1U) << "callers check the threshold first";
 }
 
 TEST_P(LogContract, KeepsTheLinesOfManyThreadsWholeAndEachThreadsInOrder)

@@ -1,5 +1,5 @@
-// The contract of platform/Notifications.h: names that are posted, whose handlers run on their queues and find the
-// state that was posted.
+// The contract of platform/Notifications.h: a post of a name calls its handlers on their queues, and they can read the
+// posted state.
 #include "platform/contract/Contract.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/settings/LinuxNotifications.h"
@@ -205,7 +205,7 @@ TEST_P(NotificationsContract, HaveNoStateUnlessOneWasPosted)
     ASSERT_FALSE(subject->notifications().state(ringer.token));
     EXPECT_NE(subject->notifications().state(ringer.token).error(), 0U);
     subject->post("ringer", std::nullopt);
-    ASSERT_TRUE(ringer.waitForMoreThan(0)) << "a post it is all the same";
+    ASSERT_TRUE(ringer.waitForMoreThan(0)) << "it still counts as a post";
     EXPECT_EQ(ringer.told()[0].state, std::nullopt);
 }
 

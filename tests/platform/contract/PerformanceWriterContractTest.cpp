@@ -33,7 +33,7 @@ public:
     virtual ~PerformanceWriterSubject() = default;
     [[nodiscard]] virtual platform::PerformanceWriter& writer() = 0;
     [[nodiscard]] virtual platform::FileSystem& files() = 0;
-    // The file that stands there, if one does.
+    // The file at that path, if it exists.
     [[nodiscard]] virtual std::optional<Document> read(const std::filesystem::path& path) = 0;
 };
 
@@ -183,7 +183,7 @@ TEST_P(PerformanceWriterContract, OpensNoFileWhereNoneCanBe)
     EXPECT_EQ(subject->writer().open(root / "missing/results", "p", 1), nullptr) << "its folder is missing";
     EXPECT_EQ(subject->writer().open("/outside/results", "p", 1), nullptr);
     ASSERT_TRUE(subject->files().createDirectories(path, 0777));
-    EXPECT_EQ(open(), nullptr) << "a folder stands there";
+    EXPECT_EQ(open(), nullptr) << "a folder has its name";
     EXPECT_NE(subject->writer().open(path / "inside", "p", 1), nullptr);
 }
 

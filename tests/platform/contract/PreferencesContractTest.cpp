@@ -1,4 +1,4 @@
-// The contract of platform/Preferences.h: values by domain and key, as they are stored now.
+// The contract of platform/Preferences.h: the stored values by domain and key.
 #include "platform/contract/Contract.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "support/TemporaryDirectory.h"
@@ -15,7 +15,7 @@ using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
 
-// A value, and how the device's owner writes it.
+// A value, and its text as the device's owner writes it.
 struct Setting {
     Value value;
     std::string text;

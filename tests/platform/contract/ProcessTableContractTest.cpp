@@ -1,4 +1,4 @@
-// The contract of platform/ProcessTable.h: processes by number, under the names that the kernel has of them.
+// The contract of platform/ProcessTable.h: processes by number, with the kernel's names for them.
 #include "platform/contract/Contract.h"
 #include "platform/linux/NamedProcess.h"
 #include "platform/linux/process/LinuxProcessTable.h"
@@ -119,7 +119,7 @@ TEST_P(ProcessTableContract, HasAQuestionMarkForEachByteOfANameThatIsNotUtf8)
 {
     const std::int32_t process = subject->start("\xff\xfe player \xc3\xa9");
     EXPECT_EQ(nameOf(process), "?? player \xc3\xa9");
-    subject->rename(process, "cut in a sign \xe9\x9f\xb3"); // of which the fifteenth byte is the first of three
+    subject->rename(process, "cut in a sign \xe9\x9f\xb3"); // its fifteenth byte is the first of three
     EXPECT_EQ(nameOf(process), "cut in a sign ?");
 }
 

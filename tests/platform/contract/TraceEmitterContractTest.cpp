@@ -40,7 +40,7 @@ private:
     support::FakeTraceEmitter emitter_;
 };
 
-// A pipe stands for the marker of the kernel.
+// A pipe stands in for the marker of the kernel.
 class LinuxTraceEmitterSubject final : public TraceEmitterSubject {
 public:
     LinuxTraceEmitterSubject()

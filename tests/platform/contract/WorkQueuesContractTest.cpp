@@ -25,10 +25,10 @@ public:
     [[nodiscard]] virtual platform::WorkQueues& queues() = 0;
     // Runs waiting items, if the queues have no threads.
     virtual void work() { }
-    // Lets so much time pass, if it does not pass by itself.
+    // Advances the time by so much, if it does not pass anyway.
     virtual void letPass(std::chrono::nanoseconds) { }
     [[nodiscard]] virtual Seconds now() const = 0;
-    // Whether the process gets another thread.
+    // Whether the process can start another thread.
     virtual void setThreads(bool areThere) = 0;
 };
 
@@ -97,7 +97,7 @@ TEST_P(WorkQueuesContract, SerialQueuesRunOneItemAtATimeInTheOrderOfSubmission)
          {QualityOfService::UserInteractive, QualityOfService::Default, QualityOfService::Background}) {
         const auto queue = makeQueue(quality);
         const std::size_t before = progress.look([&] { return noted.size(); });
-        std::vector<int> ran; // without a lock: one item at a time touches it
+        std::vector<int> ran; // no lock: one item at a time uses it
         for (int item = 0; item < 1000; ++item)
             queue->submit([&, item] { ran.push_back(item); });
         queue->submit(noting("done"));
@@ -222,7 +222,7 @@ TEST_P(WorkQueuesContract, DelayedItemsRunOnTheirQueueNotBeforeTheirTimeAndInIts
     const auto later = [&](std::chrono::milliseconds delay, const std::string& item) {
         subject->queues().submitAfter(delay, *queue, [&, delay, item] {
             EXPECT_TRUE(queue->isCurrent());
-            EXPECT_GE(subject->now() - begin, Seconds(delay) - Seconds(1us)); // which a double may miss
+            EXPECT_GE(subject->now() - begin, Seconds(delay) - Seconds(1us)); // a double is less exact
             note(item);
         });
     };
@@ -246,7 +246,7 @@ TEST_P(WorkQueuesContract, AnItemWhoseTimeHasPassedRunsSoon)
 TEST_P(WorkQueuesContract, AnItemThatIsDelayedForEverHoldsUpNothing)
 {
     const auto queue = makeQueue();
-    subject->letPass(1s); // so that the longest delay leads beyond all times
+    subject->letPass(1s); // so that no time on the way is later than the longest delay
     subject->queues().submitAfter(std::chrono::nanoseconds::max(), *queue, [] { ADD_FAILURE(); });
     subject->queues().submitAfter(1ms, *queue, noting("soon"));
     subject->letPass(1ms);

@@ -1,4 +1,4 @@
-// Every wrong configuration has a line of its own; and the exchange with the service manager.
+// Every wrong configuration has its own error line; and the exchange with the service manager.
 #include "platform/linux/LaunchConfiguration.h"
 
 #include "platform/linux/process/ServiceManager.h"
@@ -163,7 +163,7 @@ TEST_F(LaunchConfigurationTest, SaysWhichDirectoryCannotBeReached)
 
 TEST_F(LaunchConfigurationTest, SaysWhichDirectoryCannotBeWrittenTo)
 {
-    // As a user who does not own the directory; a privileged test changes its user first.
+    // Runs as a user that does not own the directory; a privileged test changes its user first.
     ::chmod(root.c_str(), 0755);
     ::chmod((root / "state").c_str(), 0555);
     const pid_t child = ::fork();

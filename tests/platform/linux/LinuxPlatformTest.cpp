@@ -90,7 +90,7 @@ TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)
         sent.set_value();
     });
     sent.get_future().wait();
-    std::promise<void> turnEnded; // the turn of the next item begins when that of the first has ended
+    std::promise<void> turnEnded; // the next item's turn begins after it
     queue->submit([&] { turnEnded.set_value(); });
     turnEnded.get_future().wait();
     providers.analyticsStore().flush();

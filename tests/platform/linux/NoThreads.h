@@ -1,4 +1,4 @@
-// A process that gets no more threads, as long as this lives: each would have a stack larger than all memory.
+// A process that gets no more threads as long as this object exists: each would have a stack larger than all memory.
 #pragma once
 
 #include <cstddef>

@@ -1,5 +1,5 @@
-// The queue between a program's threads and the connection's: order, room and limits, against a model, and from many
-// threads at once.
+// The queue between a program's threads and the client's thread: order, room and limits, against a model, and with many
+// threads at the same time.
 #include "calls/CallQueue.h"
 
 #include <deque>
@@ -68,10 +68,10 @@ TEST(CallQueue, KeepsRoomFreeForThoseWhoNeedIt)
     while (queue.push({record}, 512))
         ++taken;
     EXPECT_EQ(taken, (capacity - 512) / 128);
-    EXPECT_TRUE(queue.push({record})) << "who does not keep the room free may use it";
+    EXPECT_TRUE(queue.push({record})) << "a caller that keeps no room free may use it";
 }
 
-// Against a model: whatever is pushed and popped, in whatever order and size, across any number of rounds.
+// Against a model: pushes and pops of any content, order and size, over any number of rounds.
 RC_GTEST_PROP(CallQueue, IsAQueueWhateverIsPushedAndPopped, ())
 {
     CallQueue queue(256);
@@ -97,8 +97,8 @@ RC_GTEST_PROP(CallQueue, IsAQueueWhateverIsPushedAndPopped, ())
     RC_ASSERT(queue.front() == std::nullopt);
 }
 
-// Every record says who pushed it, which one it is, and repeats one byte: whatever the threads do to each other, each
-// arrives whole, once, and after its predecessors.
+// Every record names its thread and its number, and repeats one byte. In any interleaving of the threads, each record
+// arrives whole, once, and after the earlier ones of its thread.
 TEST(CallQueue, TakesFromManyThreadsAtOnceWithoutLosingMixingOrRepeatingAnything)
 {
     constexpr std::size_t producers = 4;
@@ -131,7 +131,7 @@ TEST(CallQueue, TakesFromManyThreadsAtOnceWithoutLosingMixingOrRepeatingAnything
         mistakes += text != expected ? 1 : 0;
         queue.popFront();
     }
-    for (std::thread& thread : threads) // after a mistake they would wait for ever
+    for (std::thread& thread : threads) // after a failure they would wait for ever
         mistakes == 0 ? thread.join() : thread.detach();
     EXPECT_EQ(mistakes, 0U);
     EXPECT_TRUE(queue.isEmpty());

@@ -1,4 +1,5 @@
-// Which answer is whose: calls that are answered once, twice, late or never, and what no honest service would answer.
+// Which answer belongs to which call: calls that are answered once, twice, late or never, and answers that no honest
+// service would send.
 #include "calls/CallTable.h"
 
 #include <gmock/gmock.h>
@@ -15,7 +16,7 @@ using libkesto::CallHead;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
-// A table whose answers are written down in words.
+// A table that records its answers as words.
 class CallTableTest : public testing::Test {
 protected:
     struct Entry {
@@ -72,7 +73,7 @@ TEST_F(CallTableTest, AnswersACallOnceAndReleasesIt)
     EXPECT_EQ(table_.unanswered(), 0U);
 
     EXPECT_TRUE(answer(1, {true}));
-    EXPECT_THAT(events_, ElementsAre("create", "~create")) << "a second answer is nobody's";
+    EXPECT_THAT(events_, ElementsAre("create", "~create")) << "a second answer belongs to no call";
     EXPECT_EQ(counters_.unexpectedAnswers.get(), 1U);
 }
 
@@ -99,7 +100,7 @@ TEST_F(CallTableTest, CallsBackTwiceForTheServiceTypeOfReporterZero)
 TEST_F(CallTableTest, AnswersAStartWhenItsStopIsAnsweredAndThenReleasesIt)
 {
     add(1, KESTO_OPERATION_START_SESSION, 42, "start");
-    EXPECT_TRUE(table_.isAnsweredUpTo(1)) << "nobody waits for a start";
+    EXPECT_TRUE(table_.isAnsweredUpTo(1)) << "flushes do not wait for starts";
     add(2, KESTO_OPERATION_STOP_SESSION, 42, "stop");
     EXPECT_TRUE(answer(1, {true}));
     EXPECT_THAT(events_, ElementsAre("start"));
@@ -151,7 +152,7 @@ TEST_F(CallTableTest, DoesNotKeepAnsweredStartsWithoutBound)
         add(number, KESTO_OPERATION_START_SESSION, static_cast<kesto_reporter>(number), "start");
         ASSERT_TRUE(answer(number, {true}));
     }
-    EXPECT_EQ(events_.size(), count + 100) << "each was answered, and those beyond the bound are released";
+    EXPECT_EQ(events_.size(), count + 100) << "each was answered, and those beyond the limit are released";
 }
 
 TEST_F(CallTableTest, LosesWhatIsUnansweredExactlyOnce)

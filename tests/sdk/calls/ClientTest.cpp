@@ -205,7 +205,7 @@ TEST_F(ClientTest, GivesWhatTheStateCallbackSaysAheadOfWhatWasSentBefore)
 {
     kesto::Options given = options();
     foundation::Mutex gate;
-    kesto::Client client; // ends before what its callback uses
+    kesto::Client client; // destroyed before the objects that its callback uses
     gate.lock();
     given.stateChanged = [&](const kesto::StateChange& change) {
         if (change.state != State::Connected)
@@ -239,7 +239,7 @@ TEST_F(ClientTest, ClosesWithEverythingAnswered)
     EXPECT_THAT(answers_.entries(), ElementsAre("create", "send", "start: the client is closed"));
     EXPECT_THAT(states_.entries(), ElementsAre(State::Connected, State::Closed));
     EXPECT_EQ(client_.state(), State::Closed);
-    EXPECT_EQ(client_.close(longEnough), Status::Ok) << "a second time is nothing";
+    EXPECT_EQ(client_.close(longEnough), Status::Ok) << "a second close does nothing";
     EXPECT_EQ(client_.createSession(43), Status::Closed);
     EXPECT_EQ(client_.send(message, Category::Playback, EventType::Start, 42), Status::Closed);
     EXPECT_EQ(client_.flush(longEnough), Status::Closed);

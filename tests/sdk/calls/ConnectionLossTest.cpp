@@ -1,4 +1,4 @@
-// What becomes of calls, sessions and clients when the service goes, was never there, or talks nonsense.
+// What happens to calls, sessions and clients if the service goes, never existed, or sends nonsense.
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"
 #include "sdk/ServedClientTest.h"
@@ -87,14 +87,14 @@ TEST_F(ConnectionLossTest, TellsAFlushThatWaits)
     open(false);
     client_.createSession(42);
     EXPECT_THAT(client_.flush(longEnough),
-                testing::AnyOf(Status::ConnectionLost, // while it waited, or before
+                testing::AnyOf(Status::ConnectionLost, // during the wait, or before it
                                Status::NotConnected));
 }
 
 TEST_F(ConnectionLossTest, AnswersWhatWaitedForAConnectionThatCouldNotBeMade)
 {
     kesto::Options options;
-    options.socketPath = path_; // where nobody is
+    options.socketPath = path_; // no service listens there
     foundation::Mutex gate;
     gate.lock();
     options.stateChanged = [&](const kesto::StateChange& change) {
@@ -105,7 +105,7 @@ TEST_F(ConnectionLossTest, AnswersWhatWaitedForAConnectionThatCouldNotBeMade)
         EXPECT_FALSE(change.willRetry);
         states_.add(change.state);
     };
-    kesto::Client client; // ends before what its callback uses
+    kesto::Client client; // destroyed before the objects that its callback uses
     EXPECT_EQ(client.open(options), Status::Ok);
     const Status taken = client.createSession(42, answers_.named("create"));
     gate.unlock();
@@ -125,7 +125,7 @@ TEST_F(ConnectionLossTest, ConnectsAgainWhenTheServiceIsBackAndBeginsWithoutSess
     options.firstRetry = std::chrono::milliseconds(1);
     options.longestRetry = std::chrono::milliseconds(20);
     sdk_test::Recorder<std::string> connected;
-    kesto::Client client; // ends before what its callback uses
+    kesto::Client client; // destroyed before the objects that its callback uses
     options.stateChanged = [&](const kesto::StateChange& change) {
         if (change.state != State::Connected)
             return;
@@ -175,7 +175,7 @@ TEST_F(ConnectionLossTest, DoublesThePauseBetweenAttemptsUpToTheLongest)
         if (change.state == State::Disconnected)
             pauses.add(change.retryAfter.count());
     };
-    kesto::Client client; // ends before what its callback uses
+    kesto::Client client; // destroyed before the objects that its callback uses
     ASSERT_EQ(client.open(options), Status::Ok);
     const auto first = pauses.waitFor(5);
     EXPECT_THAT(std::vector(first.begin(), first.begin() + 5), ElementsAre(1, 2, 4, 6, 6));
@@ -189,9 +189,9 @@ TEST_F(ConnectionLossTest, KillingTheServiceIsAnsweredByTheLossOfTheConnection)
     EXPECT_THAT(answers_.waitFor(1), ElementsAre("kill" + lost));
 }
 
-// ---- Services that are none ----
+// ---- Services that break the protocol ----
 
-// What a client does when it is sent these bytes in place of the answer to its first call.
+// What a client does when it gets these bytes in place of the answer to its first call.
 class HostileServiceTest : public ConnectionLossTest {
 protected:
     void expectViolation(std::string_view bytes)
@@ -282,7 +282,7 @@ TEST_F(HostileServiceTest, AnswersThatNobodyWaitsForAreCountedAndNothingElse)
     EXPECT_GE(client_.statistics().unexpected_answers, 2U);
 }
 
-// Whatever a service sends, each call is answered exactly once, and the client can be closed.
+// For any bytes of a service, each call is answered exactly once, and the client can be closed.
 RC_GTEST_PROP(HostileService, NeverHurtsItsClientWhateverItSends, ())
 {
     const auto noise = *rc::gen::container<std::string>(rc::gen::arbitrary<char>());
@@ -298,7 +298,7 @@ RC_GTEST_PROP(HostileService, NeverHurtsItsClientWhateverItSends, ())
     options.socketPath = directory / "service";
     RC_ASSERT(client.open(options) == Status::Ok);
     std::size_t taken = client.createSession(42, answers.named("create")) == Status::Ok ? 1 : 0;
-    taken += client.validate(42, answers.named("validate")) == Status::Ok ? 1 : 0; // unless it is over by now
+    taken += client.validate(42, answers.named("validate")) == Status::Ok ? 1 : 0; // unless the connection has ended
     client.close(longEnough);
     RC_ASSERT(answers.entries().size() == taken);
 }

@@ -1,4 +1,4 @@
-// Who rings when: the promise that sending makes no system call while a session is started.
+// Which calls ring, and when: the promise that sending makes no system call while a session is started.
 #include "calls/Mailbox.h"
 
 #include <gtest/gtest.h>
@@ -15,7 +15,7 @@ protected:
     bool send() { return mailbox_.putMessage(message_, {}, "entries"); }
     bool call(kesto_operation operation) { return mailbox_.putCall({.operation = operation}); }
 
-    // Whether somebody rang since this was asked last.
+    // Whether a call has rung since the last check.
     bool hasRung()
     {
         pollfd doorbell{mailbox_.doorbell(), POLLIN, 0};
@@ -77,7 +77,7 @@ TEST_F(MailboxTest, MessagesBehindAStartDoNotRingThoughTheThreadStillSleeps)
     takeAll();
     ASSERT_TRUE(mailbox_.fallAsleep());
     EXPECT_TRUE(send());
-    EXPECT_TRUE(hasRung()) << "once the start is taken, a thread that sleeps all the same is woken";
+    EXPECT_TRUE(hasRung()) << "once the start is taken, a sleeping thread is woken";
 }
 
 TEST_F(MailboxTest, AStartThatFindsNoRoomRingsForThoseWhoCountedOnIt)

@@ -1,4 +1,4 @@
-// What `send` promises: counts, bounds, many threads, no allocation, no system call.
+// The promises of `send`: counts, limits, many threads, no allocation, no system call.
 #include "kesto/kesto.hpp"
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
@@ -52,7 +52,7 @@ protected:
 
     Status send(const kesto::Message& message) { return client_.send(message, Category::IO, EventType::Error, 42); }
 
-    // Sends until the queue refuses: how many it took.
+    // Sends until the queue refuses; returns the number of messages taken.
     std::uint64_t fill(const kesto::Message& message)
     {
         std::uint64_t taken = 0;
@@ -94,7 +94,7 @@ TEST_F(SendTest, RefusesAMessageOfMoreThanAQuarterOfTheQueue)
     kesto::Message large;
     EXPECT_EQ(send(large.add("text", std::string(1100, 'x'))), Status::TooLarge);
     EXPECT_EQ(client_.statistics().dropped_unusable, 1U);
-    EXPECT_EQ(client_.setConfiguration(large, 42), Status::Ok) << "a configuration may be as large as it likes";
+    EXPECT_EQ(client_.setConfiguration(large, 42), Status::Ok) << "the queue does not limit a configuration";
     kesto::Message small;
     EXPECT_EQ(send(small.add("text", std::string(500, 'x'))), Status::Ok);
     EXPECT_EQ(client_.flush(longEnough), Status::Ok);
@@ -102,7 +102,7 @@ TEST_F(SendTest, RefusesAMessageOfMoreThanAQuarterOfTheQueue)
               Status::TooLarge);
 }
 
-// In a queue with room for it the frame is the bound, whatever of it is entries and what is reporters.
+// If the queue has room, the frame is the limit, for any share of entries and reporters.
 TEST_F(SendTest, SendsWhatFitsIntoAFrameAndRefusesWhatDoesNot)
 {
     constexpr std::size_t longestFrame = std::size_t{1} << 20;
@@ -131,7 +131,7 @@ TEST_F(SendTest, SendsWhatFitsIntoAFrameAndRefusesWhatDoesNot)
     }
     EXPECT_GT(fits, longestFrame - reporters.size() * 9 - 256) << "nearly all of a frame can be used";
     EXPECT_EQ(client_.statistics().answered, sent);
-    EXPECT_EQ(client_.statistics().connections, 1U) << "the service took every one";
+    EXPECT_EQ(client_.statistics().connections, 1U) << "the service took all messages";
 }
 
 TEST_F(SendTest, SendsToAsManyReportersAsTheServiceTakes)
@@ -148,7 +148,7 @@ TEST_F(SendTest, SendsToAsManyReportersAsTheServiceTakes)
               Status::TooLarge);
 }
 
-// A service that does not answer fills the queue, and then messages are refused: memory stays as it is.
+// A service that does not answer fills the queue, and then messages are refused: memory does not grow.
 TEST_F(SendTest, RefusesAndCountsWhatDoesNotFitBehindAServiceThatDoesNotAnswer)
 {
     kesto::Options options;
@@ -164,7 +164,7 @@ TEST_F(SendTest, RefusesAndCountsWhatDoesNotFitBehindAServiceThatDoesNotAnswer)
     EXPECT_GT(taken, 30U);
     EXPECT_LT(taken, 8192U / 64);
     EXPECT_EQ(client_.stopSession(42), Status::Ok) << "room is kept for other calls";
-    while (client_.statistics().sent < 16) // the library counts them just after they have left
+    while (client_.statistics().sent < 16) // the library counts them just after it has sent them
         std::this_thread::yield();
     kesto::Statistics statistics = client_.statistics();
     EXPECT_EQ(statistics.queued, 16 + taken);
@@ -233,7 +233,7 @@ TEST_F(SendTest, TakesMessagesOfManyThreadsAndKeepsTheOrderOfEach)
                   {0, messagesEach}, {1, messagesEach}, {2, messagesEach}, {3, messagesEach}}));
 }
 
-// Nothing but the message itself can bring the thread to send it.
+// Only the message itself can make the thread send it.
 TEST_F(SendTest, WakesAThreadThatSleeps)
 {
     for (const bool wakeOnSend : {false, true}) {
@@ -252,7 +252,7 @@ TEST_F(SendTest, WakesAThreadThatSleeps)
     }
 }
 
-// While a session is started the thread looks by itself, so that its messages arrive without anybody ringing.
+// While a session is started, the thread polls the queue, so that its messages arrive without a ring.
 TEST_F(SendTest, ReachesTheServiceWithoutRingingWhileASessionIsStarted)
 {
     connect();
@@ -284,7 +284,7 @@ TEST_F(SendTest, AllocatesNothing)
 
 // ---- No system call ----
 
-// From here on every system call of this thread but the end of the process kills it.
+// From here on, every system call of this thread kills the process, except the one that ends it.
 void forbidSystemCalls()
 {
     sock_filter program[] = {
@@ -301,8 +301,8 @@ void forbidSystemCalls()
 constexpr std::uint64_t messagesWithoutSystemCalls = 20'000;
 
 // In a process of its own: makes a client and then, while system calls are forbidden, sends until so many messages are
-// answered. With a started session as fast as the queue takes them; without one each when the one before has been
-// answered, so that the client's thread goes to sleep in between.
+// answered. With a started session it sends as fast as the queue accepts. Without one it waits for each answer, so that
+// the client's thread goes to sleep in between.
 [[noreturn]] void sendWithoutSystemCalls(int serviceIsThere, const std::string& path, bool isStarted)
 {
     ::alarm(static_cast<unsigned>(sdk_test::patience.count()));
@@ -330,11 +330,11 @@ constexpr std::uint64_t messagesWithoutSystemCalls = 20'000;
         message.clear().add("number", queued).add("volume", 0.5).add("device", "Speaker");
         queued += client.send(message, Category::Playback, EventType::Start, 42) == Status::Ok ? 1 : 0;
     }
-    ::syscall(SYS_exit_group, 0); // rather than _exit, of which sanitizers make more than that
+    ::syscall(SYS_exit_group, 0); // not _exit: with sanitizers it makes further system calls
     __builtin_unreachable();
 }
 
-// A process that is forked off while there is no other thread, and a service for it.
+// A process that is forked while it has only one thread, and a service for it.
 class SendWithoutSystemCalls : public testing::Test {
 protected:
     void SetUp() override

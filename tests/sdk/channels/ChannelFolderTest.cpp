@@ -23,7 +23,7 @@ TEST(ChannelRoot, IsThatOfTheUsersServiceWhereThereIsOne)
     const support::TemporaryDirectory runtime;
     const EnvironmentVariable root("KESTO_CHANNEL_ROOT", "");
     const EnvironmentVariable directory("XDG_RUNTIME_DIR", runtime.path().string());
-    EXPECT_EQ(libkesto::usualChannelRoot(), "/run/kesto/channels") << "no service of the user's";
+    EXPECT_EQ(libkesto::usualChannelRoot(), "/run/kesto/channels") << "the user has no service";
     std::filesystem::create_directory(runtime / "kesto");
     EXPECT_EQ(libkesto::usualChannelRoot(), runtime / "kesto/channels");
 }

@@ -40,7 +40,7 @@ protected:
             channel.enter((count + static_cast<std::size_t>(thread)) % 4, libkesto::ChannelClock::now());
     }
 
-    // Since the last time.
+    // The changes since the last call.
     std::uint64_t rings()
     {
         std::uint64_t count = 0;

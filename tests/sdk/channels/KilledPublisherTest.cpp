@@ -48,10 +48,10 @@ class KilledPublisherTest : public testing::Test {
 protected:
     KilledPublisherTest() { fs::create_directory(root); }
 
-    // Publishes channels, which are groups, subgroups and names of the driver "amp"; never ends by itself.
+    // Publishes channels, which are groups, subgroups and names of the driver "amp"; it never ends.
     [[nodiscard]] bool publish(const std::vector<std::array<std::string, 3>>& names) const
     {
-        static kesto::Publisher publisher; // of the process that runs this function
+        static kesto::Publisher publisher; // static: it lives as long as the process
         static std::vector<kesto::SimpleChannel> channels;
         kesto::PublisherOptions options;
         options.root = root;
@@ -122,11 +122,11 @@ TEST_F(KilledPublisherTest, TheNextPublisherOfTheDriverClearsAwayWhatItLeft)
     const std::string owner = ownerOf(root / "amp/Tx/-/a");
     killed.kill();
     support::writeFile(root / "amp/Speaker/dock" / (".kesto-" + owner + ".tmp"), "sim");
-    support::writeFile(root / "amp/Speaker/dock/.kesto-0123456789abcdef.tmp", "of one that is long gone");
+    support::writeFile(root / "amp/Speaker/dock/.kesto-0123456789abcdef.tmp", "of a publisher that ended long ago");
     support::writeFile(root / "amp/.kesto-0123456789abcdef.owner", "");
     const Victim next = publisher({{"Rx", "", "c"}});
     EXPECT_THAT(files(), ElementsAre("amp/.kesto-" + ownerOf(root / "amp/Rx/-/c") + ".owner", "amp/Rx/-/c"));
-    EXPECT_FALSE(fs::exists(root / "amp/Speaker")) << "nor are its folders left";
+    EXPECT_FALSE(fs::exists(root / "amp/Speaker")) << "its folders are removed, too";
 }
 
 TEST_F(KilledPublisherTest, TheNextPublisherLeavesAloneWhatIsNotItsToClear)
@@ -175,9 +175,9 @@ TEST_F(KilledPublisherTest, FilesOfOtherUsersAreNotCleared)
 TEST_F(KilledPublisherTest, LivesInAnotherNamespaceOfProcessesToo)
 {
     if (::geteuid() != 0)
-        GTEST_SKIP() << "only root makes one at will";
+        GTEST_SKIP() << "only root can make a namespace in any case";
     const pid_t outer = ::fork();
-    if (outer == 0) { // whose children are in the new one
+    if (outer == 0) { // its children are in the new namespace
         if (::unshare(CLONE_NEWPID) != 0)
             ::_exit(errno == EPERM ? 2 : 1);
         Victim contained([this] { return ::getpid() == 1 && publish({{"Tx", "", "a"}}); });
@@ -188,7 +188,7 @@ TEST_F(KilledPublisherTest, LivesInAnotherNamespaceOfProcessesToo)
     int status = 0;
     ASSERT_EQ(::waitpid(outer, &status, 0), outer);
     if (WEXITSTATUS(status) == 2)
-        GTEST_SKIP() << "there can be no other here";
+        GTEST_SKIP() << "a namespace cannot be made here";
     EXPECT_EQ(status, 0);
 }
 
@@ -276,7 +276,7 @@ TEST_F(KilledPublisherTest, APublisherClaimsItsFilesAnewWhenItsOwnerFileWasRemov
     EXPECT_THAT(channels(), ElementsAre("a"));
 }
 
-// The administrator may have made all folders but the last one, and given only that away.
+// The administrator may have made all folders and given only the last one to this user.
 TEST_F(KilledPublisherTest, APublisherThatMayNotClaimItsFilesWritesThemAllTheSame)
 {
     constexpr uid_t nobody = 65534;

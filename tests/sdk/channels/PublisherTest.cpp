@@ -43,7 +43,7 @@ protected:
         EXPECT_THAT(reading.channels, SizeIs(1));
         return reading.channels.empty() ? -1 : reading.channels[0].value;
     }
-    // Whether the publisher's thread writes that value before the time is over.
+    // Whether the publisher's thread writes that value in time.
     [[nodiscard]] bool waitForValue(std::int64_t expected) const
     {
         const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(10);
@@ -330,7 +330,7 @@ TEST_F(PublisherTest, RefusesNamesThatNoChannelCanHave)
     EXPECT_EQ(channel.create(publisher, {"amp", "Tx", "-", "a"}), Status::InvalidArgument);
     EXPECT_EQ(channel.create(publisher, {"amp\xFF", "Tx", "", "a"}), Status::InvalidUtf8);
     EXPECT_EQ(channel.create(publisher, {longest + "n", "Tx", "", "a"}), Status::TooLarge);
-    EXPECT_FALSE(fs::exists(root)) << "nothing of it was begun";
+    EXPECT_FALSE(fs::exists(root)) << "nothing of it was written";
     EXPECT_EQ(channel.create(publisher, {longest, longest, longest, longest}), Status::Ok);
     EXPECT_EQ(read().channels.at(0).name, longest);
 }

@@ -1,4 +1,4 @@
-// What a message holds is what the wire's own decoder reads out of it, in the shortest form that there is.
+// The wire's own decoder reads the content of a message, which must have the shortest encoding.
 #include "wire/MessageEncoder.h"
 
 #include "foundation/cbor/Cbor.h"
@@ -141,7 +141,7 @@ TEST(Message, KeepsTheKindOfNumbers)
     EXPECT_EQ(dictionary.find("boolean")->number()->kind(), foundation::Number::Kind::Boolean);
 }
 
-// Heads of containers grow with what they hold, and move what follows.
+// Heads of containers grow with their content, and move what follows.
 TEST(Message, TakesContainersOfAnySize)
 {
     for (const int count : {0, 1, 23, 24, 255, 256, 65535, 65536}) {

@@ -1,5 +1,5 @@
-// Where a client looks for the service: what it was told comes before the environment, and that before the places that
-// the service has as packaged.
+// Where a client looks for the service: the option comes before the environment, and the environment before the usual
+// places of the packaged service.
 #include "wire/ServicePath.h"
 
 #include "support/EnvironmentVariable.h"

@@ -101,7 +101,7 @@ bool FakeAnalytics::isUsed(const std::string& name) const
                                [&](const auto& pattern) { return fnmatch(pattern.c_str(), name.c_str(), 0) == 0; });
 }
 
-// Events are there at once: what a turn delays is for those to test that keep them.
+// Events are stored immediately: only real stores delay the events of a turn, and their tests cover this.
 void FakeAnalytics::sendAnalyticsEventLazy(platform::Turn&, std::string_view eventName, PayloadBuilder payloadBuilder)
 {
     sendAnalyticsEventLazy(platform::outsideTurn, eventName, std::move(payloadBuilder));

@@ -1,5 +1,5 @@
 // An analytics service that keeps the sent events. It is as lazy as a service may be: it builds a payload only when the
-// test reads it. It drops unwanted events at once.
+// test reads it. It drops unwanted events immediately.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -24,17 +24,17 @@ void PrintTo(const AnalyticsEvent& event, std::ostream* out);
 // Any thread.
 class FakeAnalytics final : public platform::Analytics {
 public:
-    // From now on events whose name matches the glob are wanted; at first none are.
+    // From now on events with a name that matches the glob are wanted; at first none are.
     void use(std::string pattern);
 
     // The observer gets each name that the service asks about.
     void setObserver(std::function<void(const std::string&)> observer) { observer_ = std::move(observer); }
 
-    // The names asked about, and those of the events sent that were wanted, in order. Builds nothing.
+    // The names that the service asked about, and those of the wanted events that it sent, in order. Builds nothing.
     [[nodiscard]] std::vector<std::string> asked() const;
     [[nodiscard]] std::vector<std::string> sent() const;
-    // The sent events, in the second form only those of one name; builds missing payloads. Events whose payload JSON
-    // cannot express are lost.
+    // The sent events, in the second form only those of one name; builds missing payloads. Events with a payload that
+    // JSON cannot express are lost.
     [[nodiscard]] std::vector<AnalyticsEvent> events();
     [[nodiscard]] std::vector<foundation::Dictionary> payloads(std::string_view name);
     // The builders of the sent events, in order, for a test that builds the payloads itself; the events are forgotten.

@@ -1,4 +1,4 @@
-// The rules that a real connection keeps are expectations here: no call before reading begins, none after the end.
+// Expectations check the rules that a real connection keeps: no call before reading begins, none after the end.
 #include "support/fakes/FakeConnection.h"
 
 #include "platform/linux/connection/FrameReader.h"
@@ -70,7 +70,8 @@ std::expected<void, platform::Connection::Violation> FakeConnection::deliverNext
 
 void FakeConnection::resume()
 {
-    EXPECT_TRUE(callHandler_ && interruptionHandler_ && invalidationHandler_) << "what comes at once must be handled";
+    EXPECT_TRUE(callHandler_ && interruptionHandler_ && invalidationHandler_)
+        << "calls may come immediately, so all handlers must be set";
     isResumed_ = true;
 }
 

@@ -1,5 +1,5 @@
 // A connection without a socket, seen from the client's side: the test makes calls, reads the answers, and ends the
-// connection in one way or the other.
+// connection in any of several ways.
 //
 // Every frame is encoded and decoded in both directions, so that a client can send exactly what is possible on a wire
 // (and cannot, for example, pass an object of the service's own).
@@ -25,8 +25,8 @@ public:
 
     explicit FakeConnection(std::int32_t processIdentifier) : processIdentifier_(processIdentifier) { }
 
-    // The peer makes one call. It is delivered at once unless too many calls are unanswered; then later, with the next
-    // call or with `readOn`. After a violation the connection breaks.
+    // The peer makes one call. It is delivered immediately unless too many calls are unanswered; then later, with the
+    // next call or with `readOn`. After a violation the connection breaks.
     std::expected<void, Violation> call(foundation::Array frame);
     std::expected<void, Violation> readOn();
     // The frames that came back.
@@ -92,7 +92,7 @@ public:
     std::shared_ptr<FakeConnection> connect(std::int32_t processIdentifier);
 
     void setDelegate(platform::ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
-    // Returns at once: the test makes connections.
+    // Returns immediately: the test makes connections.
     void resume() override { }
     void stop() override;
 

@@ -1,4 +1,4 @@
-// A kernel trace whose events the test makes up.
+// A kernel trace with events that the test makes.
 #pragma once
 
 #include "platform/KernelTrace.h"
@@ -42,7 +42,7 @@ public:
     // Delivers the event to every running session that filters for its code; with its wall-clock time to those that
     // enabled it. Events are delivered in the order of time.
     void deliver(platform::KernelTraceEvent event);
-    // So many events are lost to every running session.
+    // Every running session loses so many events.
     void lose(std::uint64_t count);
 
     bool isAvailable() override { return available; }

@@ -29,7 +29,7 @@ class FakeLog final : public platform::Log {
 public:
     // By default all levels are enabled; call this before the first statement.
     void setThreshold(platform::LogLevel level) { threshold_ = level; }
-    // The observer gets every line at once. For tests that cannot read the lines later, such as death tests.
+    // The observer gets each line immediately. For tests that cannot read the lines later, such as death tests.
     void setObserver(std::function<void(const LogLine&)> observer) { observer_ = std::move(observer); }
 
     [[nodiscard]] std::vector<LogLine> lines() const;

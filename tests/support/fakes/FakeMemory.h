@@ -1,4 +1,4 @@
-// How much memory was let go.
+// Counts the freed bytes that the service reports.
 #pragma once
 
 #include "platform/Memory.h"

@@ -27,7 +27,7 @@ public:
 
     // The registered names; a registration's token is its index here, from 1.
     [[nodiscard]] std::vector<std::string> registered() const;
-    // The tokens whose state was read, in order.
+    // The tokens whose state the service read, in order.
     [[nodiscard]] const std::vector<std::int32_t>& asked() const { return asked_; }
 
     Registration registerNotification(std::string_view name, std::shared_ptr<platform::WorkQueue> queue,

@@ -30,12 +30,12 @@ public:
         std::optional<Error> sample;
     };
 
-    // Puts the channel in place of the one of the same driver, group, subgroup and name, or adds it.
+    // Replaces the channel of the same driver, group, subgroup and name, or adds it.
     void publish(platform::ReportingChannel channel);
     void withdraw(const platform::ReportingChannel& channel);
     void withdrawAll() { channels_.clear(); }
     Failures& failures(Name group, Name subgroup) { return failures_[{std::move(group), std::move(subgroup)}]; }
-    // Is told of every sample before it is taken.
+    // The observer is called before every sample.
     void setSampleObserver(std::function<void()> observer) { sampleObserver_ = std::move(observer); }
     void failDifferences(std::optional<Error> error) { differenceError_ = error; }
 

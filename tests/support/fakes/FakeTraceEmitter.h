@@ -20,7 +20,7 @@ struct KeptEmission {
 // Any thread.
 class FakeTraceEmitter final : public platform::TraceEmitter {
 public:
-    // The observer gets each code at once.
+    // The observer gets each code immediately.
     void setObserver(std::function<void(std::uint32_t)> observer) { observer_ = std::move(observer); }
     // Whether a trace runs; at first one does.
     void setTraced(bool isTraced)
@@ -29,7 +29,7 @@ public:
         isTraced_ = isTraced;
     }
 
-    // The codes since the last time, of the service's own events.
+    // The codes of the service's markers since the last call.
     std::vector<std::uint32_t> take()
     {
         std::vector<std::uint32_t> codes;

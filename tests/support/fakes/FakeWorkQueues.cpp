@@ -95,7 +95,7 @@ bool FakeWorkQueues::runOne()
     {
         const Run run(*this, *item.queue);
         item.work(turn);
-        item.work = nullptr; // what it holds is let go of on its queue
+        item.work = nullptr; // released on its queue
     }
     if (auto send = turn.letters.take())
         send();

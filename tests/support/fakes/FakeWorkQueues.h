@@ -1,8 +1,8 @@
-// Work queues without threads: everything runs on the test's own thread when the test says so, in the order in
-// which it was submitted, and delayed work when virtual time reaches it.
+// Work queues without threads: everything runs on the test's own thread when the test says so. Items run in the order
+// in which they were submitted, and delayed work when virtual time reaches it.
 //
-// What a real serial queue promises holds here too: while one of its items waits for a semaphore, other queues
-// go on and this one does not. Each item is a turn of its own, and what it sent leaves behind it.
+// The promises of a real serial queue hold here too: while one of its items waits for a semaphore, other queues go on
+// and this one does not. Each item is a turn of its own; what it sent leaves after it.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -49,7 +49,7 @@ public:
     // The serial queues that were made, in order.
     [[nodiscard]] const std::vector<MadeQueue>& made() const { return made_; }
 
-    // Throws as when a thread cannot be started.
+    // Throws as the system would if it refused a thread.
     std::shared_ptr<platform::WorkQueue> makeSerialQueue(std::string_view name,
                                                          platform::SerialQueueOptions options) override;
     std::shared_ptr<platform::TurnQueue> makeTurnQueue(std::string_view name,

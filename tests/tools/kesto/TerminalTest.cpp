@@ -21,7 +21,7 @@ TEST(Printable, ReplacesWhatMovesTheCursorOrChangesColours)
     EXPECT_EQ(printable("cut \xC2"
                         "a \xC2"),
               "cut \xC2"
-              "a \xC2"); // halves of characters, which every terminal knows to show
+              "a \xC2"); // parts of characters; terminals can show them
 }
 
 TEST(Fitted, CutsBetweenCharacters)

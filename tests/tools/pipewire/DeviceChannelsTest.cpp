@@ -230,7 +230,7 @@ TEST_F(DeviceChannelsTest, WhatIsSaidOfUnknownDevicesIsIgnored)
     EXPECT_THAT(file("Speaker/-/any"), HasSubstr("Running 0 "));
 }
 
-// ---- Where publishing fails, or another user was first ----
+// ---- Publishing fails, or another user was first ----
 
 class DeviceChannelsInTroubleTest : public testing::Test {
 protected:
@@ -298,7 +298,7 @@ TEST_F(DeviceChannelsInTroubleTest, WhatIsWrongIsSaidOnceWithTheFolderItsOwnerAn
     std::filesystem::remove(root);
     std::filesystem::create_symlink("missing/folder", root);
     EXPECT_THAT(said([this] { channels->flush(); }), HasSubstr("No such file or directory"))
-        << "something else is wrong now";
+        << "now there is another problem";
 }
 
 TEST_F(DeviceChannelsInTroubleTest, AFolderThatIsMissingIsNamed)

@@ -110,8 +110,8 @@ protected:
     {
         return select("json_extract(payload, '$." + key + "')", "name = 'com.quarn." + event + "'");
     }
-    // The names of all events, without what all of them begin with, and without those of clients and drivers, which
-    // come when they come.
+    // The names of all events, without their common beginning, and without those of clients and drivers, which come at
+    // any time.
     [[nodiscard]] std::vector<std::string> events() const
     {
         return select("substr(name, 17)",

@@ -184,7 +184,7 @@ TEST_F(GraphCyclesTest, WhatIsLateBeforeItStopsWasLate)
 TEST_F(GraphCyclesTest, AStreamIsNotBlamedForCyclesFromBeforeItSetOff)
 {
     addStream(42, 502);
-    passCycle(5, 42); // an ID is used again at once
+    passCycle(5, 42); // IDs are soon used again
     graph.setRunning(42, true, at(6));
     listener.news();
     passCycle(5.9, 42);

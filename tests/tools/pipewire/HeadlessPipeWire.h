@@ -29,7 +29,8 @@ public:
     [[nodiscard]] std::string readLine() const;
     void kill(int signal) const;
     void closeInput();
-    // Waits for it to end by itself. Its exit status, or 128 and its signal's number.
+    // Waits for the program to end without a signal from the test. Returns its exit status, or 128 and its signal's
+    // number.
     int wait();
     [[nodiscard]] pid_t pid() const noexcept { return pid_; }
 

@@ -33,7 +33,7 @@ protected:
             return name.error();
         return folder.add(*name, {{"signature.json", "{}"}, {"response.json", "{}"}}, {{"log.txt", bulk}});
     }
-    // A capture of that number, as it is called at noon.
+    // A capture of that number, with its name at noon.
     [[nodiscard]] fs::path capture(int number) const
     {
         auto text = std::to_string(number);
@@ -125,7 +125,7 @@ TEST_F(BugCaptureFolderTest, CapturesNothingWhoseNumberItCannotKeep)
     BugCaptureFolder folder(state);
     EXPECT_TRUE(addTo(folder));
     EXPECT_THAT(namesIn(captures), IsEmpty());
-    EXPECT_THAT(namesIn(state), ElementsAre("bug-captures", "bug-captures.last")) << "nor is anything left";
+    EXPECT_THAT(namesIn(state), ElementsAre("bug-captures", "bug-captures.last")) << "and no file is left";
 }
 
 TEST_F(BugCaptureFolderTest, OldestBulkGoesFirstAndItsSignatureStays)
@@ -162,7 +162,7 @@ TEST_F(BugCaptureFolderTest, ACaptureLargerThanAllThatIsAllowedIsKeptAsASignatur
     BugCaptureFolder folder(state, Limits{.mostBytes = 1000});
     ASSERT_FALSE(addTo(folder, "small"));
     ASSERT_FALSE(addTo(folder, std::string(1001, 'x')));
-    EXPECT_TRUE(hasBulk(1)) << "nothing had to go for it";
+    EXPECT_TRUE(hasBulk(1)) << "no capture was removed for it";
     EXPECT_FALSE(hasBulk(2));
     EXPECT_TRUE(fs::exists(capture(2) / "signature.json"));
 }
@@ -194,7 +194,7 @@ TEST_F(BugCaptureFolderTest, SaysWhenTheDiskHasNoRoomForOthers)
     EXPECT_EQ(BugCaptureFolder(state / "missing").checkFreeSpace(), std::errc::no_such_file_or_directory);
 }
 
-// --- whole or not at all
+// --- complete or missing
 
 TEST_F(BugCaptureFolderTest, RemovesWhatAKilledServiceLeftWhenItStarts)
 {
@@ -273,7 +273,7 @@ TEST_F(BugCaptureFolderTest, KilledAtAnyMomentEveryCaptureThatIsSeenIsWhole)
     BugCaptureFolder folder(state, limits);
     ASSERT_FALSE(addTo(folder));
     EXPECT_LE(namesIn(captures).size(), 6U);
-    EXPECT_FALSE(namesIn(captures).front().starts_with('.')) << "nothing that is half remains";
+    EXPECT_FALSE(namesIn(captures).front().starts_with('.')) << "no incomplete capture remains";
 }
 
 // --- links

@@ -27,7 +27,7 @@ protected:
         support::writeFile(folder / "status", "Name:\t" + name + "\nState:\tR (running)\n");
         support::writeFile(folder / "stat", std::to_string(number) + " (" + name + ") R 1\n");
         support::writeFile(folder / "cmdline", "/usr/bin/" + name + "\0--loud\0"s);
-        support::writeFile(folder / "wchan", "do_poll"); // without a line's end
+        support::writeFile(folder / "wchan", "do_poll"); // without an end of line
         support::writeFile(folder / "limits", "Limit  Soft\nMax open files  1024\n");
     }
     void addSound(const std::string& path, std::string_view text)
@@ -91,8 +91,10 @@ TEST_F(BugEvidenceTest, DescribesTheProcessThatIsAskedForFirstHoweverManyShareIt
     EXPECT_THAT(pids(processEvidence(proc, "player", 200)), testing::ElementsAre(200, 4, 5, 6));
     EXPECT_EQ(*processEvidence(proc, "player", 200).find("found"), Value(6)) << "each is counted once";
     EXPECT_THAT(pids(processEvidence(proc, "player", 5)), testing::ElementsAre(5, 4, 6, 11));
-    EXPECT_THAT(pids(processEvidence(proc, "player", 201)), testing::ElementsAre(4, 5, 6, 11)) << "it is another one";
-    EXPECT_THAT(pids(processEvidence(proc, "player", 999)), testing::ElementsAre(4, 5, 6, 11)) << "it is gone";
+    EXPECT_THAT(pids(processEvidence(proc, "player", 201)), testing::ElementsAre(4, 5, 6, 11))
+        << "the ID belongs to another process";
+    EXPECT_THAT(pids(processEvidence(proc, "player", 999)), testing::ElementsAre(4, 5, 6, 11))
+        << "the process has gone";
 }
 
 TEST_F(BugEvidenceTest, KeepsSoMuchOfAFileAtMost)

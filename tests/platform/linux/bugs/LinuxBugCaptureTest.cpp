@@ -79,7 +79,7 @@ TEST_F(LinuxBugCaptureTest, WhoAsksDoesNotWaitForTheDisk)
     LinuxBugCapture capture(state, sources(), ProviderLog(log));
     request(capture);
     EXPECT_THAT(responses, IsEmpty());
-    EXPECT_FALSE(fs::exists(captures)) << "nothing is touched before the background queue comes to it";
+    EXPECT_FALSE(fs::exists(captures)) << "nothing is written before the background queue runs";
     queues.runAll();
     ASSERT_THAT(responses, SizeIs(1));
     EXPECT_TRUE(succeeded(responses[0]));
@@ -94,7 +94,7 @@ TEST_F(LinuxBugCaptureTest, TellsWhereTheSnapshotIs)
                 ElementsAre(Dictionary{{"success", true},
                                        {"snapshot", "00000001-20270115T080000Z"},
                                        {"directory", (captures / "00000001-20270115T080000Z").native()}}));
-    EXPECT_EQ(json("response.json"), responses[0]) << "as it was told";
+    EXPECT_EQ(json("response.json"), responses[0]) << "as in the request";
     EXPECT_THAT(log.recentLines().text(),
                 HasSubstr("captured a bug: " + (captures / "00000001-20270115T080000Z").native()));
 }
@@ -128,7 +128,7 @@ TEST_F(LinuxBugCaptureTest, KeepsHowTheServiceWasWhenItAsked)
     int timesAsked = 0;
     capture.setStateDescription([&timesAsked] { return Value(Dictionary{{"sessions", ++timesAsked}}); });
     request(capture);
-    EXPECT_EQ(timesAsked, 1) << "at once: later it is another state";
+    EXPECT_EQ(timesAsked, 1) << "immediately, because the state differs later";
     queues.runAll();
     EXPECT_EQ(json("state/service.json"), (Dictionary{{"sessions", 1}}));
     request(capture);
@@ -269,7 +269,7 @@ TEST_F(LinuxBugCaptureTest, LeavesTheDiskToOthersWhenThereIsLittleRoom)
     queues.runAll();
     EXPECT_THAT(responses,
                 ElementsAre(Dictionary{{"success", false}, {"reason", "less than 1099511627776 MiB are free"}}));
-    EXPECT_FALSE(fs::exists(captures)) << "that is looked at first";
+    EXPECT_FALSE(fs::exists(captures)) << "this is checked first";
     EXPECT_THAT(log.recentLines().text(), HasSubstr("a bug was not captured in " + captures.native()));
 }
 
@@ -283,7 +283,7 @@ TEST_F(LinuxBugCaptureTest, SaysWhatIsWrongWithTheDisk)
     fs::remove(captures);
     request(capture);
     queues.runAll();
-    EXPECT_TRUE(succeeded(responses.at(1))) << "and goes on when it is right again";
+    EXPECT_TRUE(succeeded(responses.at(1))) << "goes on when the problem is solved";
 }
 
 TEST_F(LinuxBugCaptureTest, RemovesLeftoversWhenItStarts)

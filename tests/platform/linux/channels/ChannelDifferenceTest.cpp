@@ -1,4 +1,4 @@
-// Differences of channels: which values are subtracted, and when a channel has begun anew.
+// Differences of channels: which values are subtracted, and when a channel was reset.
 #include "platform/linux/channels/ChannelDifference.h"
 
 #include <algorithm>
@@ -41,7 +41,7 @@ ReportingChannel states(std::vector<StateResidency> given)
     return channel;
 }
 
-// Of two samples with one channel each.
+// The difference of two samples with one channel each.
 ReportingChannel difference(const ReportingChannel& from, const ReportingChannel& to)
 {
     return channelDifference({{from}}, {{to}}).channels.at(0);
@@ -103,7 +103,7 @@ TEST(ChannelDifference, TakesAHistogramOfWhichOneBucketWentDownForOneThatBeganAn
         difference(histogram(3, 37, {{.lower = 0, .upper = 10, .hits = 5}, {.lower = 10, .upper = 20, .hits = 1}}),
                    histogram(4, 11, {{.lower = 0, .upper = 10, .hits = 4}, {.lower = 10, .upper = 20, .hits = 3}}));
     EXPECT_EQ(channel.buckets[0].hits, 4);
-    EXPECT_EQ(channel.buckets[1].hits, 3) << "all of a channel begins anew with one of its counters";
+    EXPECT_EQ(channel.buckets[1].hits, 3) << "if one counter was reset, the whole channel was";
 }
 
 TEST(ChannelDifference, TakesAHistogramWithOtherBucketsForANewOne)
@@ -204,7 +204,7 @@ TEST(ChannelDifference, TellsChannelsApartByAllOfTheirNames)
 }
 
 // For all changes of counters, a difference does not exceed the later value, and differences add up unless a channel
-// began anew.
+// was reset.
 RC_GTEST_PROP(ChannelDifferenceProperty, NeverReportsMoreThanThereIs, ())
 {
     const auto counts = *rc::gen::container<std::vector<std::pair<std::uint32_t, std::uint32_t>>>(

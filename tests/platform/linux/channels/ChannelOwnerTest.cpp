@@ -79,7 +79,7 @@ protected:
     [[nodiscard]] std::vector<std::string> channels() const
     {
         const auto reading = ChannelTree(root).read({}).value();
-        EXPECT_THAT(reading.problems, IsEmpty()) << "what was left is nothing wrong";
+        EXPECT_THAT(reading.problems, IsEmpty()) << "leftover files are not a problem";
         std::vector<std::string> names;
         for (const ReportingChannel& channel : reading.channels)
             names.push_back(*channel.name);
@@ -152,7 +152,7 @@ TEST_F(ChannelOwnerTest, NothingButAFileIsAnOwner)
     EXPECT_THAT(channels(), IsEmpty());
     fs::remove(ownerFile);
     ASSERT_EQ(::mkfifo(ownerFile.c_str(), 0600), 0);
-    EXPECT_THAT(channels(), IsEmpty()) << "nor is it waited for";
+    EXPECT_THAT(channels(), IsEmpty()) << "the test of the lock does not wait";
     fs::remove(ownerFile);
     const FileDescriptor other = own("1111111111111111");
     fs::create_symlink(".kesto-1111111111111111.owner", ownerFile);

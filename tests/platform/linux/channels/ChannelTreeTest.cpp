@@ -321,7 +321,7 @@ TEST_F(ChannelTreeTest, LooksAtSoManyNamesInAllFoldersAndNoMore)
     };
     constexpr std::size_t all = 4 * 2 + 3 + 6; // "." and "..", the folders, the files
     EXPECT_EQ(countWith(all), 0U);
-    EXPECT_EQ(countWith(all - 1), 1U) << "at least, and it says so";
+    EXPECT_EQ(countWith(all - 1), 1U) << "the line says \"at least\"";
     EXPECT_EQ(countWith(1), 1U);
     EXPECT_THAT(ChannelTree(root, {.names = 4}).read({})->channels, IsEmpty());
 }

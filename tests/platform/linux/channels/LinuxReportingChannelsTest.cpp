@@ -98,7 +98,7 @@ TEST_F(LinuxReportingChannelsTest, SayOnceWhatIsWrongWithAFile)
     EXPECT_THAT(log.take(), IsEmpty());
     publish("amp/Speaker/-/wrong", "complicated\n1\n");
     EXPECT_THAT(sample(subscribed).channels, SizeIs(1));
-    EXPECT_THAT(log.take(), SizeIs(1)) << "something else is wrong now";
+    EXPECT_THAT(log.take(), SizeIs(1)) << "now there is another problem";
     publish("amp/Speaker/-/wrong", "simple\n2\n");
     EXPECT_THAT(sample(subscribed).channels, SizeIs(2));
     EXPECT_THAT(log.take(), IsEmpty());
@@ -179,7 +179,7 @@ TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
     for (const char* name : {"a", "b", "c", "d", "e"})
         publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
     sampleAll();
-    EXPECT_THAT(log.take(), ElementsAreArray(wrong)) << "again, after it was right in between";
+    EXPECT_THAT(log.take(), ElementsAreArray(wrong)) << "again, because it was correct in between";
 }
 
 TEST_F(LinuxReportingChannelsTest, OfSoundCardsAreThereThoughTheTreeCannotBeRead)

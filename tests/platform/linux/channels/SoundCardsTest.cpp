@@ -105,8 +105,8 @@ TEST_F(SoundCardsTest, OfASystemOnAChipMayBeInAnyState)
     EXPECT_THAT(state("SnapCard/Rx/pcm3c/sub0 state"), Pair("RUNNING", 0U)) << "the program asked for no time stamps";
     EXPECT_THAT(state("SnapCard/Tx/pcm10p/sub0 state"), Pair("XRUN", 21'000U));
     const auto names = namesOf(read());
-    EXPECT_THAT(names, testing::Not(testing::Contains("SnapCard/Tx/pcm2p/sub0 format"))) << "none is chosen";
-    EXPECT_EQ(names.back(), "SnapCard/Tx/pcm10p/sub0 format") << "after those with one digit";
+    EXPECT_THAT(names, testing::Not(testing::Contains("SnapCard/Tx/pcm2p/sub0 format"))) << "no format is set";
+    EXPECT_EQ(names.back(), "SnapCard/Tx/pcm10p/sub0 format") << "after the streams with one digit";
 }
 
 TEST_F(SoundCardsTest, ThatAreNotInUseHaveTheirPointersAtRest)

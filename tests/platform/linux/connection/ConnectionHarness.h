@@ -21,10 +21,10 @@ namespace support {
 
 inline constinit platform::LogCategory connectionTestCategory{"com.quarn.kesto", "kerc"};
 
-// Keeps everything that happens on a connection, in order.
+// Keeps all events of a connection, in order.
 struct ConnectionRecord {
     std::shared_ptr<platform::Connection> connection;
-    std::vector<platform::Connection::Call> calls; // unless the test handles them; with who made them
+    std::vector<platform::Connection::Call> calls; // with their callers; empty if the test handles the calls
     std::vector<std::string> history; // "call 1", "interrupted", "invalidated"
     std::vector<std::thread::id> threads; // of the history
 };
@@ -49,7 +49,7 @@ protected:
     using Handler = std::function<std::expected<void, platform::Connection::Violation>(ConnectionRecord&,
                                                                                        platform::Connection::Call&)>;
 
-    void TearDown() override { stop(); } // while all of the test is there still
+    void TearDown() override { stop(); } // while all members of the test exist
 
     // Starts the listener and returns when it is listening.
     void listen()
@@ -112,7 +112,7 @@ protected:
         return true;
     }
 
-    // The lines of connections that broke, and those of connections that were behind.
+    // The log lines of connections that broke, and of connections that were behind.
     [[nodiscard]] std::vector<std::string> logged() { return linesThatAreBehind(false); }
     [[nodiscard]] std::vector<std::string> loggedBehind() { return linesThatAreBehind(true); }
     [[nodiscard]] static std::string endsBecause(const std::string& reason)
@@ -127,7 +127,7 @@ protected:
     Progress progress;
     std::vector<std::shared_ptr<ConnectionRecord>> records;
     Handler handler; // instead of keeping the call
-    std::function<void()> beforeListening; // what is to be set on the listener
+    std::function<void()> beforeListening; // sets up the listener
     std::unique_ptr<platform::LinuxConnectionListener> listener;
     std::thread thread;
 

@@ -1,5 +1,5 @@
-// Clients that ask for too much or read too little, and too many of them: each limit holds, costs only whoever met
-// it, and is left again.
+// Clients that ask for too much or read too little, and too many clients: each limit holds, affects only the client
+// that reached it, and ends with its cause.
 #include "platform/linux/connection/ConnectionHarness.h"
 #include "support/Sanitizers.h"
 
@@ -21,8 +21,8 @@ using testing::StartsWith;
 
 class ConnectionLimits : public support::ConnectionTest {
 protected:
-    // Writes calls with so much text, numbered from 0, until the service has stopped reading them and the socket
-    // is full; how many were written, but for the last one's `unfinished` rest.
+    // Writes calls with so much text, numbered from 0, until the service has stopped reading them and the socket is
+    // full. Returns the number of complete calls; `unfinished` is the rest of the next one.
     int writeUntilNotRead(SocketClient& client, std::size_t textLength)
     {
         for (int number = 0;; ++number) {
@@ -46,7 +46,7 @@ TEST_F(ConnectionLimits, ASlowReaderGetsAllOfALargeAnswer)
     SocketClient client(path);
     ConnectionRecord& record = connected();
     for (int answer = 1; answer <= answers; ++answer)
-        support::sendAtOnce(*record.connection, answerTo({answer}, 700 * 1024)); // more than a socket takes
+        support::sendAtOnce(*record.connection, answerTo({answer}, 700 * 1024)); // more than a socket accepts
     EXPECT_EQ(client.readNumbers(answers), (std::vector<int>{1, 2, 3, 4, 5, 6}));
 }
 
@@ -87,7 +87,7 @@ TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
     SocketClient other(path);
     ConnectionRecord& otherRecord = connected();
     std::size_t sent = 0;
-    while (sent <= LinuxConnection::mostUnsentBytes + 1024 * 1024) { // more than the socket takes on top
+    while (sent <= LinuxConnection::mostUnsentBytes + 1024 * 1024) { // the rest is in the socket
         const std::string answer = answerTo({1}, answerSize);
         support::sendAtOnce(*record.connection, answer);
         sent += frameHeadSize + answer.size();
@@ -126,14 +126,14 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheBytesOfUnansweredCallsAreTooMany)
     EXPECT_GT(calls * (textLength + 16), LinuxConnection::mostUnansweredBytes);
     EXPECT_LT(calls * textLength, LinuxConnection::mostUnansweredBytes + ConnectionHub::mostReadAtOnce + textLength);
 
-    // Another client is read from, and nothing more of this one.
+    // The service reads from another client, but not from this one.
     SocketClient other(path);
     ConnectionRecord& otherRecord = connected();
     other.write(callNumber(1));
     ASSERT_TRUE(waitForHistory(otherRecord, {"call 1"}));
     EXPECT_EQ(callsOf(record), calls);
 
-    // The answers let it go on, from whichever thread they come.
+    // When the calls are answered, on any thread, reading goes on.
     std::vector<Connection::Call> answered = progress.look([&] { return std::exchange(record.calls, {}); });
     answered.clear();
     client.write(unfinished);
@@ -156,7 +156,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheUnansweredCallsAreTooMany)
     EXPECT_TRUE(waitForCalls(record, 1));
 }
 
-// A client that takes no answers any more may have much to say still.
+// A client that accepts no more answers may still send many calls.
 TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAllTheSame)
 {
     listen();
@@ -173,11 +173,11 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAllTheSame)
     EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2", "invalidated"}));
 }
 
-// Reading stops because of what waits to be sent, and nothing of it is: it must go on when all of that was dropped.
+// Reading pauses because of unsent answers. All of them are dropped without being sent, and then reading must go on.
 TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDropped)
 {
     constexpr std::size_t answerSize = 1000 * 1024;
-    constexpr std::size_t answers = LinuxConnection::manyUnsentBytes / answerSize + 1; // a turn
+    constexpr std::size_t answers = LinuxConnection::manyUnsentBytes / answerSize + 1; // answers of one turn
     std::vector<WorkItem> letters;
     LinuxWorkQueues queues;
     queues.setTurnEndHandler([&](Turn& turn) {
@@ -205,7 +205,7 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDroppe
     EXPECT_TRUE(waitForHistory(record, {"call 1"}));
 }
 
-// As do the starts of ten thousand sessions, which are answered when they stop.
+// Also the starts of ten thousand sessions, which are answered when the sessions stop.
 TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
 {
     constexpr int starts = 10'000;
@@ -235,7 +235,7 @@ TEST_F(ConnectionLimits, AClientThatGoesWhileItIsNotReadFromIsNoticed)
     client.close();
     EXPECT_TRUE(waitForEnd(record));
     stop();
-    EXPECT_EQ(record.calls.size(), static_cast<std::size_t>(written)) << "what it had written was lost";
+    EXPECT_EQ(record.calls.size(), static_cast<std::size_t>(written)) << "the bytes that it had written were lost";
     EXPECT_THAT(loggedBehind(),
                 ElementsAre(testing::EndsWith("was behind: reading paused 1 times, 0 bytes of answers were dropped")));
 }
@@ -275,11 +275,11 @@ TEST_F(ConnectionLimits, CreditGivenBackFromManyThreadsIsAllThere)
     for (int number = 0; number < 100; ++number)
         calls += callNumber(number, 100);
     for (int sent = 0; sent < rounds; sent += 100)
-        client.write(calls); // blocks for ever when a credit is lost
+        client.write(calls); // would block for ever if a call's room were lost
     EXPECT_TRUE(waitForCounter(delivered, rounds));
 }
 
-// When descriptors run out.
+// The limit of descriptors.
 
 class Descriptors : public support::ConnectionTest {
 protected:
@@ -310,10 +310,10 @@ TEST_F(Descriptors, ClientsWaitUntilThereIsADescriptorForThem)
     SocketClient third(path);
     ConnectionRecord& ofThird = connected();
     limitTo(nextDescriptor() + 1);
-    SocketClient waiting(path); // takes the last one, so that none is left to accept it with
+    SocketClient waiting(path); // takes the last descriptor, so that the service has none to accept it
     ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
 
-    // Meanwhile the others are served, and the service does not ask again and again.
+    // Meanwhile the others are served, and the service does not try again and again.
     third.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(ofThird, {"call 1"}));
     first.write(callNumber(1));
@@ -321,7 +321,7 @@ TEST_F(Descriptors, ClientsWaitUntilThereIsADescriptorForThem)
     EXPECT_EQ(listener->counters().acceptingPauses, 1U);
     EXPECT_THAT(logged(), ElementsAre("new connections have to wait, with 3 open: Too many open files"));
 
-    // A connection that ends makes room at once.
+    // The end of a connection makes room immediately.
     waiting.write(callNumber(1));
     first.close();
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
@@ -353,7 +353,7 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
         connected();
     }
     for (int attempt = 0; attempt < 3; ++attempt)
-        EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt) << "it is closed at once";
+        EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt) << "it is closed immediately";
     EXPECT_EQ(listener->counters().refused, 3U);
     EXPECT_EQ(listener->counters().accepted, mostOfOneUser);
     EXPECT_THAT(
@@ -367,7 +367,7 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
     again.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
     EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt);
-    EXPECT_EQ(logged().size(), 2U) << "and is said again";
+    EXPECT_EQ(logged().size(), 2U) << "it is logged again";
 }
 
 TEST_F(Descriptors, SomeAreKeptFromClients)
@@ -375,7 +375,7 @@ TEST_F(Descriptors, SomeAreKeptFromClients)
     constexpr std::size_t most = 3;
     limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
     listen();
-    ::setrlimit(RLIMIT_NOFILE, &before); // what was allowed at the start counts
+    ::setrlimit(RLIMIT_NOFILE, &before); // the limit at the start counts
     std::vector<std::unique_ptr<SocketClient>> clients;
     for (std::size_t index = 0; index < most; ++index) {
         clients.push_back(std::make_unique<SocketClient>(path));

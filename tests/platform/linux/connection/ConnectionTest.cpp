@@ -1,5 +1,5 @@
-// Connections over real sockets: calls and answers, every way in which they end, and when the answers of a turn
-// leave.
+// Connections over real sockets: calls and answers, all the ways in which they end, and the time at which the answers
+// of a turn leave.
 #include "platform/linux/connection/ConnectionHarness.h"
 
 #include <array>
@@ -95,7 +95,7 @@ TEST_F(Connections, MayOutliveTheirListener)
     stop();
     listener.reset();
     support::sendAtOnce(*record.connection, answerTo(record.calls[0].frame));
-    record.calls.clear(); // which lets the caller go
+    record.calls.clear(); // releases the caller
     EXPECT_EQ(client.readNumber(), std::nullopt);
 }
 
@@ -177,7 +177,7 @@ TEST_F(Connections, ServeAThousandClientsAtOnce)
     ::setrlimit(RLIMIT_NOFILE, &before);
 }
 
-// How connections end.
+// The ends of connections.
 
 class ConnectionEnds : public support::ConnectionTest { };
 
@@ -223,7 +223,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionInsideAHead)
     EXPECT_THAT(logged(), ElementsAre(endsBecause("the stream ends inside a frame")));
 }
 
-// A peer resets a Unix connection by closing it while there is something that it has not read.
+// A peer resets a Unix connection if it closes the connection before it has read everything.
 TEST_F(ConnectionEnds, WithAnInterruptionWhenThePeerResetsIt)
 {
     listen();
@@ -233,7 +233,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionWhenThePeerResetsIt)
     ASSERT_TRUE(waitForCalls(record, 1));
     support::sendAtOnce(*record.connection, answerTo(record.calls[0].frame));
     client.waitForSomethingToRead();
-    client.write(callNumber(2)); // which is delivered still
+    client.write(callNumber(2)); // it is still delivered
     client.close();
     EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2", "interrupted", "invalidated"}));
     EXPECT_THAT(logged(), ElementsAre(endsBecause("Connection reset by peer")));
@@ -255,7 +255,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionWhenAnAnswerFindsThePeerGone)
     client.waitForSomethingToRead();
     SocketClient other(path);
     other.write(callNumber(1));
-    isHeldUp.wait(); // the connection thread, so that it cannot know before the answer does
+    isHeldUp.wait(); // the connection thread is busy, so only the answer can find that the peer has gone
     client.close();
     support::sendAtOnce(*record.connection, answerTo({2}));
     EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({2}).size());
@@ -299,7 +299,7 @@ TEST_P(Violations, EndThatConnectionWithOneLineAndNoOther)
     good.write(callNumber(1));
     ASSERT_TRUE(waitForCalls(goodRecord, 1));
 
-    bad.write(callNumber(1) + GetParam().bytes + callNumber(2)); // the second is never looked at
+    bad.write(callNumber(1) + GetParam().bytes + callNumber(2)); // the second call is never read
     EXPECT_TRUE(waitForHistory(badRecord, {"call 1", "interrupted", "invalidated"}));
     EXPECT_EQ(bad.readNumber(), std::nullopt);
     EXPECT_THAT(logged(), ElementsAre(endsBecause(GetParam().reason)));
@@ -360,7 +360,7 @@ protected:
         queue.reset();
     }
 
-    // Runs the function as a turn of its own.
+    // Runs the function as a separate turn.
     void turn(const std::function<void(Turn&)>& function)
     {
         const std::size_t before = progress.look([&] { return ended.size(); });
@@ -370,7 +370,7 @@ protected:
 
     LinuxWorkQueues queues;
     std::shared_ptr<TurnQueue> queue;
-    std::vector<WorkItem> ended; // what sends the answers of the turns that ended
+    std::vector<WorkItem> ended; // send the answers of the turns that ended
 };
 
 TEST_F(Turns, HoldTheirAnswersBackUntilWhatTheyStoredIsKept)
@@ -383,7 +383,7 @@ TEST_F(Turns, HoldTheirAnswersBackUntilWhatTheyStoredIsKept)
         record.connection->send(turn, answerTo({2}));
     });
     EXPECT_FALSE(client.hasSomethingToRead());
-    std::jthread([&] { ended[0](); }); // as a store's thread does
+    std::jthread([&] { ended[0](); }); // like a store's thread
     EXPECT_THAT(client.readNumbers(2), ElementsAre(1, 2));
 }
 
@@ -461,7 +461,7 @@ TEST_F(Turns, AreHelpedWithByTheConnectionThread)
     EXPECT_EQ(ranOn, record.threads[0]);
 }
 
-// From several threads at once, with a client that is slow at times: every answer once, each thread's in order.
+// From several threads, with a client that is sometimes slow: every answer comes once, and those of a thread in order.
 TEST_F(Turns, AnswersFromManyThreadsAllArrive)
 {
     constexpr int threads = 4;

@@ -1,5 +1,4 @@
-// Frames come out as they were sent, however the stream is cut, and nothing is reserved for what a peer only
-// announced.
+// Frames come out as they were sent, for any cuts of the stream, and a frame that is only announced takes no memory.
 #include "platform/linux/connection/FrameReader.h"
 
 #include <gtest/gtest.h>
@@ -130,7 +129,7 @@ TEST(FrameReader, GivesTheRoomForALargeFrameBack)
     EXPECT_LT(reader.heldBytes(), 64U);
 }
 
-// Were every piece to move what is there already, this would move half a terabyte.
+// If every piece moved all earlier bytes, this would move half a terabyte.
 TEST(FrameReader, PutsALargeFrameTogetherFromSingleBytesInReasonableTime)
 {
     FrameReader reader;
@@ -152,7 +151,7 @@ RC_GTEST_PROP(FrameReader, GivesTheSameFramesHoweverTheStreamIsCut, (const std::
     std::string_view rest = stream;
     while (!rest.empty()) {
         const auto count = *rc::gen::inRange<std::size_t>(1, rest.size() + 1);
-        const std::string piece(rest.substr(0, count)); // of its own, so that reading past its end is noticed
+        const std::string piece(rest.substr(0, count)); // a copy, so that a sanitizer detects reading past its end
         RC_ASSERT(read(reader, piece, received));
         rest.remove_prefix(count);
     }

@@ -1,4 +1,4 @@
-// Sockets that are bound where others were or are, and sockets that are passed.
+// Sockets that are bound at the path of an earlier socket, and sockets that are passed.
 #include "platform/linux/connection/ListeningSocket.h"
 
 #include "support/TemporaryDirectory.h"
@@ -18,7 +18,7 @@ namespace {
 
 class ListeningSocketTest : public testing::Test {
 protected:
-    // Whether somebody can connect; the number of the error otherwise.
+    // Whether a client can connect; otherwise the error number.
     [[nodiscard]] int connectError() const
     {
         const FileDescriptor client(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
@@ -34,7 +34,7 @@ protected:
         return address;
     }
 
-    // A socket file as a process leaves it behind that dies.
+    // A socket file as a dead process leaves it behind.
     void leaveBehind(int type = SOCK_STREAM) const
     {
         const FileDescriptor socket = boundSocket(type);
@@ -156,11 +156,10 @@ TEST_F(ListeningSocketTest, RefusesAPathThatIsTooLongAndTakesTheLongest)
     EXPECT_EQ(socket.error().error, ListeningSocketError::PathTooLong);
 }
 
-// Socket activation: what the service manager passes stands from descriptor 3 on, so it is tried in child
-// processes, which exit with 0 when all is well.
+// Socket activation passes descriptors from 3 on, so child processes test it. They exit with 0 if all is well.
 class SocketActivation : public ListeningSocketTest {
 protected:
-    // What a child does with these descriptors passed.
+    // What a child process does with these descriptors.
     template <typename Body> void inChild(const std::vector<int>& passed, Body body)
     {
         EXPECT_EXIT(
@@ -181,7 +180,7 @@ protected:
         return !socket && socket.error().error == ListeningSocketError::NotOneUnixListener;
     }
 
-    // Listens on a descriptor far from those that are passed.
+    // Listens on a descriptor far from the passed ones.
     [[nodiscard]] FileDescriptor listening() const
     {
         const FileDescriptor socket = boundSocket(SOCK_STREAM);
@@ -208,7 +207,7 @@ TEST_F(SocketActivation, AListenerThatIsPassedIsTaken)
         const int flags = ::fcntl(SD_LISTEN_FDS_START, F_GETFL);
         return (flags & O_NONBLOCK) != 0 && connectError() == 0 && ::accept(SD_LISTEN_FDS_START, nullptr, nullptr) >= 0;
     });
-    EXPECT_TRUE(std::filesystem::exists(path)) << "the file belongs to who bound it";
+    EXPECT_TRUE(std::filesystem::exists(path)) << "the file belongs to the process that bound it";
 }
 
 TEST_F(SocketActivation, IsTakenOnce)
@@ -229,7 +228,7 @@ TEST_F(SocketActivation, SomethingElseIsRefused)
     inChild({socket.get(), socket.get()}, isRefused); // two
 
     std::filesystem::remove(path);
-    const FileDescriptor silent = boundSocket(SOCK_STREAM); // which nobody listens on
+    const FileDescriptor silent = boundSocket(SOCK_STREAM); // no process listens on it
     inChild({silent.get()}, isRefused);
 
     std::filesystem::remove(path);

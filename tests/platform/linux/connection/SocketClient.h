@@ -1,4 +1,4 @@
-// A client of a listener that speaks in bytes: it can do everything that a hostile one could.
+// A client of a listener that sends any bytes: it can do everything that a hostile client can.
 #pragma once
 
 #include "foundation/cbor/Cbor.h"
@@ -31,7 +31,7 @@ inline std::string framed(const foundation::Value& value)
     return bytes;
 }
 
-// The call with that number, and text to make it as large as a test needs it.
+// The call with that number, and text that makes it as large as the test needs.
 inline std::string callNumber(int number, std::size_t textLength = 0)
 {
     return framed(foundation::Array{number, std::string(textLength, 'x')});
@@ -44,7 +44,7 @@ inline std::string answerTo(const foundation::Array& call, std::size_t textLengt
     return frame;
 }
 
-// Sends the frame in a turn of its own.
+// Sends the frame in its own turn.
 inline void sendAtOnce(platform::Connection& connection, std::string frame)
 {
     platform::Turn turn;
@@ -64,7 +64,7 @@ public:
             throw std::system_error(errno, std::generic_category(), "connect");
     }
 
-    // Blocks until the service has taken the bytes.
+    // Blocks until the service has accepted the bytes.
     void write(std::string_view bytes)
     {
         while (!bytes.empty()) {
@@ -75,14 +75,14 @@ public:
         }
     }
 
-    // Writes as much as the service takes without being waited for; how many bytes that were.
+    // Writes what the socket accepts without waiting, and returns the number of bytes.
     std::size_t writeWhatFits(std::string_view bytes)
     {
         const ssize_t count = ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL | MSG_DONTWAIT);
         return count < 0 ? 0 : static_cast<std::size_t>(count);
     }
 
-    // The first number of the next frame; nothing when the service closed or reset the connection.
+    // The first number of the next frame; nothing if the service closed or reset the connection.
     std::optional<int> readNumber()
     {
         while (true) {
@@ -111,7 +111,7 @@ public:
         return numbers;
     }
 
-    // Whether something is there to be read now.
+    // Whether bytes can be read now.
     bool hasSomethingToRead()
     {
         pollfd events = {socket_.get(), POLLIN, 0};

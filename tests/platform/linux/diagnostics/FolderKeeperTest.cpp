@@ -46,7 +46,7 @@ protected:
     }
     [[nodiscard]] std::vector<std::string> names() const { return support::namesIn(folder); }
 
-    // In a process of its own, which owns the files and may read the folder, but not write to it.
+    // In a process of its own, which owns the files and may read the folder, but may not write to it.
     template <typename Body> [[nodiscard]] bool isTrueWithoutRightToRemove(Body body) const
     {
         constexpr uid_t nobody = 65534;
@@ -250,7 +250,7 @@ TEST_F(FolderKeeperTest, DoesNotLookThroughALink)
                 ElementsAre(IsLine(Error, "kerl",
                                    folder.string() + " cannot be searched (Not a directory): its oldest files stay")));
     add(10);
-    EXPECT_EQ(queues.pending(), 0U) << "not with each file that comes";
+    EXPECT_EQ(queues.pending(), 0U) << "not with each new file";
 }
 
 TEST_F(FolderKeeperTest, SaysOnceWhatItCannotRemove)

@@ -33,7 +33,7 @@ protected:
         (*file)->write(text);
         return (*file)->commit();
     }
-    // Runs in a process of its own, whose limits and rights it may change; true when `body` is.
+    // Runs `body` in a separate process, so that it may change the process's limits and rights. Returns its result.
     template <typename Body> static bool inChild(Body body)
     {
         const pid_t child = ::fork();
@@ -43,7 +43,7 @@ protected:
         EXPECT_EQ(::waitpid(child, &status, 0), child);
         return WIFEXITED(status) && WEXITSTATUS(status) == 0;
     }
-    // Gives up root's right to go everywhere.
+    // Gives up root's right to use every folder.
     static bool becomeNobody()
     {
         constexpr uid_t nobody = 65534;
@@ -81,7 +81,7 @@ TEST_F(LinuxFileSystemTest, LeavesFoldersThatExistAsTheyAre)
     EXPECT_EQ(permissionsOf(root / "Audio"), 0750U);
     EXPECT_EQ(permissionsOf(root / "Audio/Reporting"), 0777U);
     ASSERT_TRUE(files.createDirectories(root, 0777));
-    EXPECT_NE(permissionsOf(root), 0777U) << "the root is not the service's to open";
+    EXPECT_NE(permissionsOf(root), 0777U) << "the service may not open the root";
 }
 
 TEST_F(LinuxFileSystemTest, FollowsALinkToTheRootWhichIsTheAdministrators)
@@ -139,7 +139,7 @@ TEST_F(LinuxFileSystemTest, MakesItsRootAgainAsItWasWhenItWentMeanwhile)
             LinuxFileSystem logs(root / "state/logs");
             fs::remove_all(gone);
             EXPECT_EQ(logs.createAtomically(root / "state/logs/a.json").error(), std::errc::no_such_file_or_directory)
-                << "only folders that are asked for are made";
+                << "only requested folders are made";
             const mode_t before = ::umask(mask);
             const auto made = logs.createDirectories(root / "state/logs/Audio", 0777);
             ::umask(before);

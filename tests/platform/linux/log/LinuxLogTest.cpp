@@ -1,5 +1,5 @@
-// Lines as they reach a descriptor and a journal, byte for byte, with clients that try to forge them and a journal
-// that is slow or gone.
+// Lines as they reach a descriptor and a journal, byte for byte, with clients that try to forge lines and a journal
+// that is slow or missing.
 #include "platform/linux/log/LinuxLog.h"
 
 #include "platform/linux/log/ProviderLog.h"
@@ -41,7 +41,7 @@ protected:
     void SetUp() override
     {
         std::array<int, 2> ends{};
-        // A socket of packets shows each write by itself.
+        // A packet socket separates the writes.
         ASSERT_EQ(::socketpair(AF_UNIX, SOCK_SEQPACKET | SOCK_CLOEXEC, 0, ends.data()), 0);
         reader = FileDescriptor(ends[0]);
         writer = FileDescriptor(ends[1]);
@@ -274,7 +274,7 @@ TEST_F(LinuxLogJournalTest, AJournalThatIsBehindLosesLinesAndIsToldHowMany)
     EXPECT_EQ(nextDatagram(), std::nullopt);
 }
 
-// --- Which of the two
+// --- The choice between the two
 
 class ScopedVariable {
 public:

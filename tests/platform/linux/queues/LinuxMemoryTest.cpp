@@ -1,4 +1,4 @@
-// When the threads are asked to tidy their heaps, and that each does it once.
+// When the threads have to tidy their heaps, and that each does so once.
 #include "platform/linux/queues/LinuxMemory.h"
 #include "platform/linux/queues/ThreadHeap.h"
 #include "support/fakes/FakeWorkQueues.h"
@@ -25,7 +25,7 @@ protected:
 TEST_F(LinuxMemoryTest, AsksForNothingWhenLittleWasLetGo)
 {
     memory.letGo(4 * megabyte - 1);
-    EXPECT_TRUE(queues.delayed().empty()) << "an idle service wakes for nothing";
+    EXPECT_TRUE(queues.delayed().empty()) << "an idle service does not wake";
     queues.advance(1h);
     EXPECT_EQ(wakings, 0);
     EXPECT_FALSE(heap.tidyIfAsked());
@@ -40,7 +40,7 @@ TEST_F(LinuxMemoryTest, WakesTheThreadsFiveSecondsAfterMuchWasLetGo)
     EXPECT_EQ(wakings, 0);
     EXPECT_FALSE(heap.isAsked());
     queues.advance(1ns);
-    EXPECT_EQ(wakings, 1) << "what little there is adds up";
+    EXPECT_EQ(wakings, 1) << "small amounts add up";
     EXPECT_TRUE(heap.isAsked());
 }
 

@@ -1,5 +1,4 @@
-// Real threads, which are made to meet at the moments that matter by letting them wait for each other, never for a
-// while.
+// Real threads. They wait for each other, and so meet at the important moments; no test waits for a fixed time.
 #include "foundation/Mutex.h"
 #include "platform/Turn.h"
 #include "platform/linux/NoThreads.h"
@@ -35,7 +34,7 @@ protected:
         return queues.makeSerialQueue("com.quarn.kesto.test", {.quality = quality});
     }
 
-    // Returns when everything submitted to the serial queue before has been run.
+    // Returns when everything that was submitted to the serial queue earlier has run.
     void drain(WorkQueue& queue)
     {
         const auto done = queues.makeSemaphore(0);
@@ -63,7 +62,7 @@ TEST_F(WorkQueuesTest, SerialQueueRunsOneItemAtATimeInTheOrderOfEachSubmitter)
     constexpr int submitters = 4;
     constexpr int items = 2000;
     const auto queue = makeQueue(QualityOfService::UserInteractive);
-    std::vector<std::vector<int>> ran(submitters); // without a lock: only the queue touches it
+    std::vector<std::vector<int>> ran(submitters); // no lock: only the queue uses it
     {
         std::vector<std::jthread> threads;
         for (int submitter = 0; submitter < submitters; ++submitter) {
@@ -95,7 +94,7 @@ protected:
     }
     ~TurnsTest() override { queue.reset(); }
 
-    // Until the queue's thread sleeps, so that it runs nothing unless it is woken.
+    // Waits until the queue's thread sleeps, so that it runs nothing until it is woken.
     void waitUntilAsleep()
     {
         queue->submit([&] { queueThread = gettid(); });
@@ -104,7 +103,7 @@ protected:
             std::this_thread::yield();
         SerialQueue::Helper helper;
         queue->submit([] { });
-        helper.help(); // after which this thread has seen what that one did
+        helper.help(); // from now on this thread sees the other thread's changes
         history.clear();
         threads.clear();
     }
@@ -155,7 +154,7 @@ TEST_F(TurnsTest, ATurnEndsWhenAllThatItsItemsHeldIsGone)
     EXPECT_EQ(history, (std::vector<int>{7, 0}));
 }
 
-// The events that turns gather and hand over: their numbers, turn by turn.
+// The events that turns gathered and handed over: their numbers, turn by turn.
 class GatheringTurns : public WorkQueuesTest {
 protected:
     GatheringTurns()
@@ -214,7 +213,7 @@ TEST_F(GatheringTurns, OfTwoQueuesAreTwo)
     one->submit([&](Turn& turn) {
         turn.events.add(1, "event", {});
         other->submit(adding(2));
-        other.reset(); // returns when that turn is over
+        other.reset(); // returns at the end of that turn
         turn.events.add(3, "event", {});
     });
     one.reset();
@@ -238,7 +237,7 @@ TEST_F(TurnsTest, AHelperRunsATurnItselfWithItsEnd)
     SerialQueue::Helper helper;
     submit(1);
     submit(2);
-    EXPECT_TRUE(history.empty()); // nobody was woken, so this is no race
+    EXPECT_TRUE(history.empty()); // no thread was woken, so this is not a race
     helper.help();
     EXPECT_EQ(history, (std::vector<int>{1, 2, 0}));
     EXPECT_EQ(std::set(threads.begin(), threads.end()), std::set{std::this_thread::get_id()});
@@ -274,8 +273,8 @@ TEST_F(TurnsTest, WhatIsSubmittedDuringAHelpedTurnGoesToTheQueuesThread)
     const auto done = queues.makeSemaphore(0);
     queue->submit([&] {
         history.push_back(1);
-        submit(2); // by the turn itself
-        std::jthread([&] { queue->submit([&] { done->signal(); }); }); // and by somebody else
+        submit(2); // on the turn's own thread
+        std::jthread([&] { queue->submit([&] { done->signal(); }); }); // and on another thread
     });
     helper.help();
     done->wait(); // without help
@@ -293,7 +292,7 @@ TEST_F(TurnsTest, TheQueuesThreadWaitsUntilAHelpedTurnHasEnded)
         std::atomic<pid_t> otherThread = 0;
         other = std::jthread([&] {
             otherThread = gettid();
-            queue.reset(); // wakes the queue's thread, which finds something to do
+            queue.reset(); // wakes the queue's thread, which has work
         });
         while (otherThread == 0 || !support::isAsleep(otherThread) || !support::isAsleep(queueThread))
             std::this_thread::yield();
@@ -339,7 +338,7 @@ TEST_F(TurnsTest, NobodyHelpsWithAQueueThatIsBusy)
 TEST_F(TurnsTest, TurnsOfHelpersAndOfTheQueuesThreadNeverOverlap)
 {
     constexpr int items = 3000;
-    int ran = 0; // without a lock: only turns touch it
+    int ran = 0; // no lock: only turns use it
     {
         std::vector<std::jthread> threadsOfHelpers;
         for (int helpers = 0; helpers < 2; ++helpers) {
@@ -376,7 +375,7 @@ TEST_F(WorkQueuesTest, OnlyQueuesThatMayBeHelpedAre)
     const SerialQueue::Helper helper;
     const auto done = queues.makeSemaphore(0);
     queue->submit([&] { done->signal(); });
-    done->wait(); // which its own thread must have run
+    done->wait(); // its own thread has run the item
 }
 
 TEST_F(WorkQueuesTest, AThreadThatHelpsHoldsNoLockWhileItSubmits)
@@ -386,7 +385,7 @@ TEST_F(WorkQueuesTest, AThreadThatHelpsHoldsNoLockWhileItSubmits)
     {
         const auto helpedByOthers = queues.makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
         const foundation::Lock lock(mutex);
-        helpedByOthers->submit([] { }); // which this thread never runs
+        helpedByOthers->submit([] { }); // this thread never runs the item
     }
     EXPECT_DEBUG_DEATH(
         {
@@ -440,7 +439,7 @@ TEST_F(WorkQueuesTest, PrioritiesFollowTheQualityOfServiceAsFarAsTheProcessMay)
     const auto interactiveQueue = makeQueue(QualityOfService::UserInteractive);
     interactiveQueue->submit([&] {
         interactive = niceValue(static_cast<id_t>(gettid()));
-        const auto ordinaryQueue = makeQueue(QualityOfService::Default); // by a thread of another priority
+        const auto ordinaryQueue = makeQueue(QualityOfService::Default); // this thread has another priority
         ordinaryQueue->submit([&] { ordinary = niceValue(static_cast<id_t>(gettid())); });
         drain(*ordinaryQueue);
     });
@@ -478,7 +477,7 @@ TEST_F(WorkQueuesTest, AHelperHasThePriorityOfTheQueuesThatItHelpsAsLongAsItDoes
         const auto ordinaryQueue = makeQueue(QualityOfService::Default);
         ordinaryQueue->submit([&] { ordinary = niceValue(static_cast<id_t>(gettid())); });
         drain(*ordinaryQueue);
-        EXPECT_EQ(ordinary, ofTheProcess) << "what a thread starts does not have its helper's priority";
+        EXPECT_EQ(ordinary, ofTheProcess) << "a new thread does not get its helper's priority";
     }
     EXPECT_EQ(niceValue(0), ofTheProcess);
 }
@@ -487,7 +486,7 @@ TEST_F(WorkQueuesTest, BackgroundItemsRunSideBySideOnAFewThreads)
 {
     constexpr std::size_t items = 40;
     const std::size_t threadsBefore = threadsOfTheProcess();
-    std::latch together(BackgroundQueue::mostThreads + 1); // reached only if so many run at once
+    std::latch together(BackgroundQueue::mostThreads + 1); // reached only if so many run at the same time
     std::latch done(items);
     for (std::size_t item = 0; item < items; ++item) {
         queues.backgroundQueue().submit([&, item] {

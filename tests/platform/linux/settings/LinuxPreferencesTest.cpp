@@ -1,5 +1,5 @@
-// Configuration that is edited, replaced, moved and broken while it is in use, in all the ways in which editors and
-// people do that; and the watcher that notices it.
+// Configuration that is edited, replaced, moved and broken while it is in use, in all the ways of editors and people;
+// and the watcher that notices the changes.
 #include "platform/linux/settings/LinuxPreferences.h"
 
 #include "platform/linux/settings/LinuxDeviceProperties.h"

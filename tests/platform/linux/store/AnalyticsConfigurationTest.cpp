@@ -1,4 +1,4 @@
-// Which events are wanted and how many are kept: what an owner may write, and what becomes of what is wrong.
+// Which events the service keeps, and how many: the settings that an owner may write, and the effect of wrong ones.
 #include "platform/linux/store/AnalyticsConfiguration.h"
 
 #include "platform/linux/settings/TomlFile.h"

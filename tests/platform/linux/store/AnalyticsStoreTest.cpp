@@ -1,5 +1,5 @@
-// That what is acknowledged is kept: with turns and without, by many threads, beyond the backlog, and when the
-// service is killed. The database is read as any program would read it.
+// Acknowledged events are kept: with turns and without, from many threads, beyond the backlog, and if the service is
+// killed. The tests read the database as any program would.
 #include "platform/linux/store/AnalyticsStore.h"
 
 #include "platform/linux/queues/LinuxWorkQueues.h"
@@ -57,7 +57,7 @@ protected:
     {
         store().sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });
     }
-    // Sends from within a turn, and ends it the way the service does.
+    // Sends in a turn, and ends the turn as the service does.
     void runTurn(std::function<void(Turn&)> items, AnalyticsStore::WhenKept whenKept)
     {
         std::promise<void> ended;
@@ -70,7 +70,7 @@ protected:
         queue->submit(std::move(items));
         ended.get_future().wait();
     }
-    // 120 events, which take so much that the log wants to be moved to the database.
+    // 120 events, large enough that the log is due to be moved to the database.
     void sendALongLog()
     {
         for (int number = 0; number < 120; ++number)
@@ -80,7 +80,7 @@ protected:
     }
     [[nodiscard]] std::int64_t storedEvents() { return StoreReader(file).eventCount(); }
 
-    // Keeps the store's thread busy until it is released: nothing is written meanwhile.
+    // Keeps the store's thread busy as long as this object exists; the thread writes nothing meanwhile.
     class Hold {
     public:
         explicit Hold(AnalyticsStore& store)
@@ -188,7 +188,7 @@ TEST_F(AnalyticsStoreTest, WhatATurnSentIsNotWrittenBeforeItsEnd)
         [&](Turn& turn) {
             sendIn(turn, 1);
             sendIn(turn, 2);
-            // The store's thread is asked to write something else meanwhile.
+            // Meanwhile another thread sends something.
             std::thread([&] {
                 send(3, "com.quarn.other");
                 while (store().keptEvents() == 0)
@@ -240,7 +240,7 @@ TEST_F(AnalyticsStoreTest, ATurnThatNobodyWaitsForIsKeptToo)
 
 TEST_F(AnalyticsStoreTest, TurnsThatGatherDuringACommitAreOneTransaction)
 {
-    // A reader sees all of them or none of them.
+    // A reader sees all of the events or none.
     Hold hold(store());
     Turn turn;
     for (int number = 0; number < 10; ++number) {
@@ -284,7 +284,7 @@ TEST_F(AnalyticsStoreTest, ManyTurnsAndManyOtherThreadsLoseNothingAndKeepTheirOr
     EXPECT_GT(acknowledged, 0);
     StoreReader reader(file);
     EXPECT_EQ(reader.eventCount(), (2 + others) * turns);
-    // In each sender's order.
+    // The order of each sender.
     EXPECT_EQ(
         reader.number("SELECT count(*) FROM (SELECT payload ->> 'n' AS n, lag(payload ->> 'n') OVER (PARTITION BY "
                       "name ORDER BY id) AS before FROM events) WHERE before >= n"),
@@ -503,7 +503,7 @@ TEST_F(AnalyticsStoreTest, AnIdleStoreDoesNotWake)
     KESTO_SKIP_WHERE_THREADS_ARE_WATCHED();
     send(1);
     store().flush();
-    // Of all threads of this process but this one, since the switch of a thread is counted when it wakes.
+    // All threads of this process except this one: the kernel counts a switch when the thread wakes.
     const auto switches = [] {
         std::uint64_t sum = 0;
         for (const auto& task : fs::directory_iterator("/proc/self/task")) {

@@ -1,5 +1,5 @@
-// What a batch hands to the database: texts that stay right when batches are joined, payloads written once for both
-// events of a message, and none for what JSON cannot say.
+// The rows that a batch gives to the database: their texts stay right when batches are joined, both events of a message
+// share one written payload, and payloads that JSON cannot express are left out.
 #include "platform/EventBatch.h"
 
 #include <fmt/format.h>
@@ -124,13 +124,13 @@ TEST(EventBatchTest, JoinedBatchesAreBothWhole)
     EventBatch batch;
     EventBatch second;
     second.add(2, "b", {{"n", 2}});
-    batch.takeFrom(second); // into an empty one
+    batch.takeFrom(second); // into an empty batch
     EXPECT_EQ(second.size(), 0U);
     second.add(3, "c", large('y'));
     second.add(3, "d", notJson);
     second.add(3, "e", {{"n", 3}});
     batch.takeFrom(second);
-    batch.takeFrom(second); // of an empty one
+    batch.takeFrom(second); // from an empty batch
     EXPECT_EQ(second.size(), 0U);
     EXPECT_EQ(second.bytes(), 0U);
     EXPECT_EQ(batch.size(), 4U);
@@ -151,7 +151,7 @@ TEST(EventBatchTest, AfterJoiningOnlyTheLastPayloadIsShared)
     batch.takeFrom(second);
     batch.add(1, "c", last);
     batch.add(1, "d", first);
-    second.add(1, "e", first); // of the second, which knows nothing of it any more
+    second.add(1, "e", first); // the second batch starts again without shared payloads
     EXPECT_THAT(rowsOf(batch), ElementsAre("1 a {\"n\":1}", "1 b {\"n\":2}", "1 c {\"n\":2}", "1 d {\"n\":1}"));
     EXPECT_THAT(rowsOf(second), ElementsAre("1 e {\"n\":1}"));
 }

@@ -1,5 +1,4 @@
-// Every reason for which events are lost, in the words that the log has for it: at once, and at the end at the
-// latest.
+// The log's words for every reason for which events are lost, immediately and, at the latest, at the end.
 #include "platform/linux/store/EventLosses.h"
 
 #include "platform/linux/store/ManualClock.h"
@@ -41,7 +40,7 @@ TEST_P(EventLossesTest, AreToldWhenTheyAreReported)
     losses->report();
     EXPECT_THAT(log.take(), tells("2 analytics events were lost (9 since the start): /state/analytics.sqlite3: "));
     losses.reset();
-    EXPECT_THAT(log.take(), IsEmpty()) << "all was told";
+    EXPECT_THAT(log.take(), IsEmpty()) << "all losses were reported";
 }
 
 TEST_P(EventLossesTest, AreToldAtTheEndAtTheLatest)

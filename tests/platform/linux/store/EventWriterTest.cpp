@@ -1,5 +1,5 @@
-// The database on disks that are full, read-only or damaged, with readers and other writers beside it, and within
-// its bounds: events may be lost, and are counted; the service never is.
+// The database on disks that are full, read-only or damaged, beside readers and other writers, and within its limits:
+// events may be lost, but are counted, and the service goes on.
 #include "platform/linux/store/EventWriter.h"
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -29,7 +29,7 @@ namespace {
 std::atomic<int> synchronizations; // with the disk, of this process
 }
 
-// What SQLite calls, in the place of the C library's.
+// SQLite calls this function in place of the C library's.
 extern "C" int fdatasync(int file)
 {
     ++synchronizations;
@@ -225,7 +225,7 @@ TEST_F(EventWriterTest, AnEventAfterOneThatIsNotJsonDoesNotGetItsPayload)
 TEST_F(EventWriterTest, FullSynchronizationIsSetAndTakenBack)
 {
     const auto synchronizationsOfACommit = [this] {
-        keep({event(1)}); // the first commit of a log is not like the others
+        keep({event(1)}); // the first commit of a log differs from the others
         const int before = synchronizations;
         keep({event(1)});
         return synchronizations - before;
@@ -248,7 +248,7 @@ TEST_F(EventWriterTest, ALongPayloadIsKeptWhole)
     EXPECT_EQ(StoreReader(file()).number("SELECT length(payload ->> 'text') FROM events WHERE id = 1"), 3'000'000);
 }
 
-// --- A database that is none, or damaged, or newer
+// --- Files that are not a database, damaged or newer
 
 TEST_F(EventWriterTest, AFileThatIsNoDatabaseIsSetAside)
 {
@@ -287,7 +287,7 @@ TEST_F(EventWriterTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
     keep(events(5000));
     closeWriter();
     {
-        // All pages but the first are rubbish.
+        // All pages except the first are damaged.
         std::fstream damaged(file(), std::ios::in | std::ios::out | std::ios::binary);
         const auto size = static_cast<std::streamsize>(fs::file_size(file()));
         damaged.seekp(4096);
@@ -395,7 +395,7 @@ TEST_F(EventWriterTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
 
 // --- Disks that fail
 
-// Runs the test as an ordinary user, in a process of its own, since privileges are not got back.
+// Runs the test as an ordinary user, in a separate process, because a process cannot get privileges back.
 template <typename Test> void runUnprivileged(const fs::path& owned, Test test)
 {
     const pid_t child = ::fork();
@@ -424,7 +424,7 @@ TEST_F(EventWriterTest, AReadOnlyDirectoryLosesEventsAndRecovers)
                                             HasSubstr("let the user of the service write")))));
         ::chmod(directory.c_str(), 0755);
         keep({event(3)});
-        EXPECT_EQ(lost(StoreError::CannotOpen), 3U); // it is not tried again with every event
+        EXPECT_EQ(lost(StoreError::CannotOpen), 3U); // the writer does not try to open it again with each event
         clock.advance(EventWriter::secondsBetweenOpenings);
         keep({event(4)});
         EXPECT_EQ(StoreReader(file()).eventCount(), 1);
@@ -485,7 +485,7 @@ TEST_F(EventWriterTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
         keep(events(100));
     const std::uint64_t lostEvents = lost(StoreError::DiskFull);
     EXPECT_GT(lostEvents, 0U);
-    EXPECT_EQ(lostEvents % 100, 0U); // whole transactions
+    EXPECT_EQ(lostEvents % 100, 0U); // only whole transactions
     EXPECT_EQ(writer().keptEvents() + lostEvents, given);
     EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(writer().keptEvents()));
     EXPECT_THAT(log.take(),
@@ -532,7 +532,7 @@ TEST_F(EventWriterTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
 TEST_F(EventWriterTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
 {
     keep({event(1, "a")});
-    // Behind SQLite's back, what it writes to becomes a file that nothing can be written to.
+    // SQLite's descriptor of the log becomes one that cannot be written to.
     const FileDescriptor unwritable(::open("/dev/null", O_RDONLY | O_CLOEXEC));
     for (const auto& open : fs::directory_iterator("/proc/self/fd"))
         if (std::error_code gone; fs::read_symlink(open, gone) == file().string() + "-wal") {
@@ -607,7 +607,7 @@ TEST_F(EventWriterTest, AReaderThatHoldsATransactionSeesOneStateAndHoldsUpNobody
 TEST_F(EventWriterTest, TheLogIsMovedToTheDatabaseBeforeItGrowsLarge)
 {
     writer().open();
-    StoreReader reader(file()); // connected, and reading now and then
+    StoreReader reader(file()); // connected; it reads only now and then
     for (int round = 0; round < 100; ++round) {
         keep(events(2000));
         maintain();
@@ -689,7 +689,7 @@ TEST_F(EventWriterTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginning
 {
     configuration.maximumSizeMegabytes = 4;
     keep(events(100));
-    // Before one ends its transaction, the other has begun one: there is never a moment without a reader.
+    // Each reader begins a transaction before the other ends its own, so that there is always a reader.
     std::jthread readers([this](const std::stop_token& stop) {
         StoreReader first(file());
         StoreReader second(file());
@@ -708,7 +708,7 @@ TEST_F(EventWriterTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginning
     for (int round = 0; round < 60; ++round) {
         keep(events(500));
         maintain();
-        clock.advance(EventWriter::secondsBetweenWaits); // a wait in vain, on a busy machine, is not the last
+        clock.advance(EventWriter::secondsBetweenWaits); // on a busy machine a wait may fail; it is repeated
     }
     EXPECT_EQ(lost(StoreError::LogHeld), 0U);
     EXPECT_LT(logBytes(), 5 * megabyte);
@@ -779,7 +779,7 @@ TEST_F(EventWriterTest, WhatIsTooMuchGoesOldestFirst)
     StoreReader reader(file());
     EXPECT_LT(fs::file_size(file()), 2 * megabyte + 2 * EventWriter::bytesBetweenChecks);
     EXPECT_EQ(reader.number("SELECT max(id) FROM events"), 30'000);
-    EXPECT_EQ(reader.number("SELECT max(id) - min(id) + 1 - count(*) FROM events"), 0); // no gap: the oldest went
+    EXPECT_EQ(reader.number("SELECT max(id) - min(id) + 1 - count(*) FROM events"), 0); // no gap: the oldest went first
     EXPECT_GT(reader.eventCount(), 3000);
     EXPECT_EQ(reader.text("PRAGMA integrity_check"), "ok");
 }

@@ -1,4 +1,4 @@
-// A clock that stands still until a test moves it, and that other threads may read meanwhile.
+// A clock that stands still until a test moves it; other threads may read it meanwhile.
 #pragma once
 
 #include "platform/Clock.h"

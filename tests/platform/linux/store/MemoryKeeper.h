@@ -1,4 +1,4 @@
-// Keeps events in memory, for tests: the least that a keeper of events can be.
+// Keeps events in memory, for tests: the smallest possible keeper.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -18,7 +18,7 @@ struct KeptEvent {
     std::string payload;
 };
 
-// The place where events are kept, which outlives its keeper as a file does. Any thread.
+// The place of the events; like a file, it outlives its keeper. Any thread.
 class KeptEvents {
 public:
     [[nodiscard]] std::vector<KeptEvent> all() const

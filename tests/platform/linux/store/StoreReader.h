@@ -1,4 +1,4 @@
-// Looks into an analytics database the way anybody may: through a connection of its own that only reads.
+// Reads an analytics database as every program may: through its own read-only connection.
 #pragma once
 
 #include <cstdint>

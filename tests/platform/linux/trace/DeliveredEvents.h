@@ -1,4 +1,4 @@
-// What a session of a kernel trace delivers, and whether its handlers are called as promised.
+// What a session of a kernel trace delivers, and whether it calls its handlers as promised.
 #pragma once
 
 #include "platform/KernelTrace.h"
@@ -13,7 +13,7 @@ namespace support {
 // Outlives the session. Any thread.
 class DeliveredEvents {
 public:
-    // Has the session tell its end here. All its handlers are to run on the queue.
+    // Sets the session's completion handler to record its end here. All handlers must run on the queue.
     void listenTo(platform::KernelTraceSession& session, const platform::WorkQueue& queue)
     {
         session.setCompletionHandler([this, &queue] {

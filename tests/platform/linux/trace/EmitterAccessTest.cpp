@@ -106,7 +106,7 @@ TEST_F(EmitterAccessTest, DoesNotLetOthersChangeThePage)
     EXPECT_NE(::ftruncate(page, 8192), 0);
     EXPECT_NE(::fallocate(page, FALLOC_FL_PUNCH_HOLE | FALLOC_FL_KEEP_SIZE, 0, 4096), 0);
     EXPECT_NE(::fcntl(page, F_ADD_SEALS, F_SEAL_WRITE), 0);
-    // Opening it anew gives no more.
+    // A second opening gives no more.
     const FileDescriptor again(::open(("/proc/self/fd/" + std::to_string(page)).c_str(), O_RDWR | O_CLOEXEC));
     EXPECT_EQ(::mmap(nullptr, 4096, PROT_READ | PROT_WRITE, MAP_SHARED, again.get(), 0), MAP_FAILED);
     EXPECT_LT(::pwrite(again.get(), "x", 1, 0), 0);

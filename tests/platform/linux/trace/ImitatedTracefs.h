@@ -31,7 +31,7 @@ public:
 
     explicit RingBufferPageBuilder(std::uint64_t time) : time_(time) { append(time); }
 
-    // A record at that time, which is not before the one ahead of it.
+    // A record at that time, which must not be before that of the previous record.
     RingBufferPageBuilder& record(std::uint64_t time, std::string_view bytes)
     {
         constexpr std::size_t mostWords = 28;
@@ -75,7 +75,7 @@ public:
         time_ = time;
         return *this;
     }
-    // Where an event of so many bytes was taken back.
+    // The place of a discarded event of so many bytes.
     RingBufferPageBuilder& takenBack(std::uint32_t after, std::uint32_t bytes)
     {
         word(29, after);
@@ -101,7 +101,7 @@ public:
         return *this;
     }
 
-    // As it is read.
+    // The complete page.
     [[nodiscard]] std::string page(std::optional<std::uint64_t> claimedSize = {}) const
     {
         std::uint64_t commit = claimedSize.value_or(data_.size() - 8);

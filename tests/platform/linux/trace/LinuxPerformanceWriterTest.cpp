@@ -131,7 +131,7 @@ TEST_F(LinuxPerformanceWriterTest, LosesRecordsThatWouldMakeTheFileTooLargeAndSa
                 ElementsAre(IsLine(Error, "kerl", path.string() + " has become too large; 2 records are lost")));
 }
 
-// So long a name, which ends the test program when it is read.
+// A very long name; reading it ends the test program.
 class UnreadableName {
 public:
     explicit UnreadableName(std::size_t size)

@@ -1,5 +1,5 @@
-// The kernel's own tracefs for a test, where this machine allows it: mounted in a name space of the process, with which
-// it goes.
+// The kernel's own tracefs for a test, if this machine allows it: mounted in a namespace of the process, and gone with
+// the process.
 #pragma once
 
 #include "support/TemporaryDirectory.h"

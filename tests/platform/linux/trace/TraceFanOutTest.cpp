@@ -122,7 +122,7 @@ TEST_F(TraceFanOutTest, TellsTheTimeOfDayToSessionsThatWantIt)
     EXPECT_EQ(wallTimeOf(3'000'002'000), (KernelTraceWallTime{.seconds = 1'700'000'004, .microseconds = 0}));
     fanOut.setWallClock(-5'000'000'000);
     EXPECT_EQ(wallTimeOf(4'250'000'000), (KernelTraceWallTime{.seconds = -1, .microseconds = 250'000}))
-        << "before 1970, the seconds are those before it, too";
+        << "before 1970, the seconds round down, too";
 }
 
 TEST_F(TraceFanOutTest, CompletesASessionOnceNothingOfItsTimeCanComeAnyMore)

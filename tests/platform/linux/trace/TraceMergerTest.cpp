@@ -55,7 +55,7 @@ TEST_F(TraceMergerTest, KeepsWhatIsTooYoung)
     EXPECT_THAT(codesUpTo(9), IsEmpty());
     EXPECT_THAT(codesUpTo(11), ElementsAre(1, 2));
     take(1, RingBufferPageBuilder(1).event(12, 4));
-    EXPECT_THAT(codesUpTo(12), ElementsAre(3, 4)) << "at one time, the lower processor goes first";
+    EXPECT_THAT(codesUpTo(12), ElementsAre(3, 4)) << "at equal times, the lower processor comes first";
     EXPECT_THAT(codesUpTo(100), IsEmpty());
     EXPECT_EQ(merger.takeLosses(), 0U);
 }
@@ -66,7 +66,7 @@ TEST_F(TraceMergerTest, LosesWhatComesTooLateRatherThanTellItInTheWrongOrder)
     take(0, RingBufferPageBuilder(1).event(49, 1).event(50, 2).event(51, 3));
     EXPECT_THAT(codesUpTo(100), ElementsAre(3));
     EXPECT_EQ(merger.takeLosses(), 2U);
-    EXPECT_EQ(merger.takeLosses(), 0U) << "told once";
+    EXPECT_EQ(merger.takeLosses(), 0U) << "reported once";
 }
 
 TEST_F(TraceMergerTest, LosesWhatGoesBackInTime)
@@ -99,7 +99,7 @@ TEST_F(TraceMergerTest, CountsWhatTheKernelAndBrokenPagesLost)
     take(0, RingBufferPageBuilder(1).event(5, 1).missed(1000));
     take(1, RingBufferPageBuilder(1).event(6, 2).bytes("?"));
     merger.take(2, {});
-    EXPECT_THAT(codesUpTo(100), ElementsAre(1, 2)) << "all that can be read is";
+    EXPECT_THAT(codesUpTo(100), ElementsAre(1, 2)) << "all readable events are read";
     EXPECT_EQ(merger.takeLosses(), 1002U);
 }
 

@@ -120,7 +120,7 @@ TEST_F(TracefsInstanceTest, BelongsToOneServiceAtATime)
     {
         const TracefsInstance gone = *std::move(instance);
     }
-    EXPECT_TRUE(open()) << "it goes with its owner";
+    EXPECT_TRUE(open()) << "the lock ends with its owner";
 }
 
 TEST_F(TracefsInstanceTest, SaysWhatItCannotDo)

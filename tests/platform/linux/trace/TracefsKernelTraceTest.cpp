@@ -77,7 +77,7 @@ public:
         session->end();
         afterEnd = now();
     }
-    // Whether it was completed, and once.
+    // Whether it was completed exactly once.
     [[nodiscard]] bool waitForCompletion() { return delivered_.waitForCompletion() && delivered_.completions() == 1; }
     [[nodiscard]] bool waitForEvents(std::size_t count) { return delivered_.waitForEvents(count); }
     [[nodiscard]] std::vector<KernelTraceEvent> events() { return delivered_.events(); }
@@ -136,7 +136,7 @@ TEST_F(TracefsKernelTraceTest, IsOnWhileASessionRunsAndOffOtherwise)
     EXPECT_EQ(tree.content("tracing_on"), "1");
     EXPECT_EQ(tree.content("buffer_size_kb"), "8192");
     again.session.reset();
-    EXPECT_TRUE(waitUntilOff()) << "a session that goes without an end is over, too";
+    EXPECT_TRUE(waitUntilOff()) << "a session that is destroyed without an end is over, too";
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
@@ -214,7 +214,7 @@ TEST_F(TracefsKernelTraceTest, LetsEmittersKnowWhetherATraceRuns)
     one.end();
     EXPECT_EQ(flag(), 1U);
     two.end();
-    EXPECT_EQ(flag(), 0U) << "at once, although it is not complete";
+    EXPECT_EQ(flag(), 0U) << "immediately, although it is not complete";
     fs::resize_file(tree.instance / "trace_marker_raw", 0);
     ownEmitter.emit(0x2104482C, {});
     EXPECT_EQ(markers(), "");
@@ -275,14 +275,14 @@ TEST_F(TracefsKernelTraceTest, CountsAsOffWithoutTracefsAndSaysSoOnce)
     EXPECT_EQ(trace.createTraceSession(), nullptr);
     EXPECT_THAT(log.take(), SizeIs(1)) << "another reason";
     fs::rename(tree.instance / "kept", tree.instance / "tracing_on");
-    EXPECT_TRUE(trace.isAvailable()) << "what was missing came";
+    EXPECT_TRUE(trace.isAvailable()) << "the missing file exists now";
     EXPECT_NE(trace.createTraceSession(), nullptr);
     EXPECT_THAT(log.take(), IsEmpty());
 }
 
 TEST_F(TracefsKernelTraceTest, TracesAlsoWhenClientsCannotEmitAndSaysSo)
 {
-    // No file may become as large as the page that clients map.
+    // No file may have the size of the page that clients map.
     rlimit before = {};
     ASSERT_EQ(::getrlimit(RLIMIT_FSIZE, &before), 0);
     const rlimit small = {.rlim_cur = TraceSwitchPage::size - 1, .rlim_max = before.rlim_max};
@@ -534,7 +534,7 @@ TEST_F(RealTraceTest, CountsWhatTheKernelLost)
     instance->readPages([&](std::uint32_t cpu, std::span<const std::byte> page) { merger.take(cpu, page); });
     const std::size_t delivered = merger.eventsUpTo(UINT64_MAX).size();
     const std::uint64_t lost = merger.takeLosses();
-    EXPECT_GE(delivered, 100'000U) << "so many a buffer holds";
+    EXPECT_GE(delivered, 100'000U) << "the capacity of a buffer";
     EXPECT_GT(lost, 0U);
     EXPECT_EQ(delivered + lost, emitted);
     instance->switchOff();

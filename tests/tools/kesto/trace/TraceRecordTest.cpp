@@ -201,7 +201,7 @@ TEST_F(TraceRecord, SaysThatResultsAreIncompleteAndEndsWithAStatusOfItsOwn)
     EXPECT_EQ(finished.status, 3);
     EXPECT_THAT(finished.errors, HasSubstr(missing));
     EXPECT_THAT(finished.output, AllOf(HasSubstr("version 4: 2046 values\nINCOMPLETE: "), HasSubstr(missing)));
-    EXPECT_EQ(recordEmitter({}, {"2", "5"}).status, 5) << "that of the program comes first";
+    EXPECT_EQ(recordEmitter({}, {"2", "5"}).status, 5) << "the program's status comes first";
 }
 
 TEST_F(TraceRecord, DoesNotRunTheProgramWhenItCouldNotReadTheResults)
