@@ -44,5 +44,6 @@ private:
     platform::FileDescriptor file_; // locked as long as the copy is needed
 };
 
-// Removes this user's copies whose processes have ended. Other files stay, and so does what cannot be removed.
+// Removes this user's copies that belong to ended processes. All other files stay, and so do copies that cannot be
+// removed.
 void removeLeftTraceParametersCopies(const std::filesystem::path& root, const std::filesystem::path& folder);

@@ -145,8 +145,8 @@ bool isOwnFileAt(int directory, const std::string& name)
         && status.st_uid == ::geteuid();
 }
 
-// The kernel cannot remove a file only if it is a certain one, so the file first gets a name that no other process
-// uses.
+// The kernel removes files by name, without a check of their identity. So the file first gets a name that no other
+// process uses.
 bool removeFileAtIf(int directory, const std::string& name, const std::string& aside,
                     const std::function<bool(const std::string&)>& isUnwanted)
 {

@@ -1,6 +1,5 @@
-// A file is not readable for other users until it is locked, so that none of them can lock it first, and all see that
-// it is still being made: not even the administrator's processes, who may open it all the same, take its maker for
-// dead.
+// Other users cannot read a file until it is locked. So none of them can lock it first, and all see that it is not
+// finished. The administrator's processes, which can open it, do not treat its maker as dead either.
 #include "platform/linux/files/LockedFile.h"
 
 #include <cerrno>
