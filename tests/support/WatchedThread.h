@@ -3,9 +3,11 @@
 #pragma once
 
 #include <atomic>
+#include <cstdint>
 #include <fstream>
 #include <functional>
 #include <string>
+#include <string_view>
 #include <thread>
 #include <unistd.h>
 #include <utility>
@@ -20,6 +22,17 @@ inline bool isAsleep(pid_t thread)
     std::getline(file, text, ')');
     file >> text;
     return text.starts_with('S');
+}
+
+// How often that thread of this process has fallen asleep, according to the kernel.
+inline std::uint64_t timesAsleep(pid_t thread)
+{
+    constexpr std::string_view field = "voluntary_ctxt_switches:";
+    std::ifstream file("/proc/self/task/" + std::to_string(thread) + "/status");
+    for (std::string line; std::getline(file, line);)
+        if (line.starts_with(field))
+            return std::stoull(line.substr(field.size()));
+    return 0; // it has ended
 }
 
 // Does its work on a thread of its own. Its destructor waits until the work is done.

@@ -314,6 +314,15 @@ TEST_F(ServiceManagerTest, IsNotifiedThatTheServiceIsReady)
     EXPECT_EQ(received(), "READY=1\nSTATUS=accepting connections");
 }
 
+TEST_F(ServiceManagerTest, IsNotifiedEachTime)
+{
+    listen();
+    notifyReady("accepting connections");
+    EXPECT_EQ(received(), "READY=1\nSTATUS=accepting connections");
+    notifyReady("accepting connections again");
+    EXPECT_EQ(received(), "READY=1\nSTATUS=accepting connections again");
+}
+
 TEST_F(ServiceManagerTest, WithoutOneNothingHappens)
 {
     notifyReady("accepting connections");

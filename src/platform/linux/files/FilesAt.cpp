@@ -2,10 +2,12 @@
 #include "platform/linux/files/FilesAt.h"
 
 #include "foundation/text/Format.h"
+#include "platform/linux/files/RegularFile.h"
 #include "platform/linux/files/SystemError.h"
 #include "platform/linux/files/WriteAll.h"
 
 #include <algorithm>
+#include <cassert>
 #include <cerrno>
 #include <cstdio>
 #include <dirent.h>
@@ -77,34 +79,14 @@ std::expected<std::string, std::error_code> readFileAt(int directory, const std:
 {
     const FileDescriptor file(
         ::openat(directory, name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
-    struct stat status = {};
-    if (!file || ::fstat(file.get(), &status) != 0)
-        return std::unexpected(systemError());
-    if (!S_ISREG(status.st_mode))
-        return std::unexpected(make_error_code(std::errc::invalid_argument));
-    constexpr std::size_t piece = 4096; // files of /proc report no size: the length is known only at the end
-    std::string bytes;
-    std::size_t length = 0;
-    while (length < most) {
-        bytes.resize(std::min(most, length + piece));
-        const ssize_t count = ::read(file.get(), bytes.data() + length, bytes.size() - length);
-        if (count < 0 && errno == EINTR)
-            continue;
-        if (count < 0)
-            return std::unexpected(systemError());
-        if (count == 0)
-            break;
-        length += static_cast<std::size_t>(count);
-    }
-    bytes.resize(length);
-    return bytes;
+    return readRegularFile(file, most);
 }
 
 std::string randomDigits()
 {
     std::uint64_t number = 0;
-    if (::getrandom(&number, sizeof number, 0) != sizeof number)
-        number = static_cast<std::uint64_t>(::getpid());
+    [[maybe_unused]] const ssize_t count = ::getrandom(&number, sizeof number, 0); // so few bytes never fail
+    assert(count == sizeof number);
     return foundation::format("{:016x}", number);
 }
 

@@ -30,10 +30,8 @@ public:
         const foundation::Lock lock(lock_);
         waiting_.push_back(std::move(item));
         const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith;
-        if (isAsleep_ && !isTurnTaken_ && !isLeftToHelper) {
-            isAsleep_ = false;
-            changed_.notifyOne(); // under the lock: after it, the item may destroy the queue
-        }
+        if (!isTurnTaken_ && !isLeftToHelper)
+            wakeThread(); // under the lock: after it, the item may destroy the queue
     }
 
     // From now on only items add items.
@@ -41,13 +39,16 @@ public:
     {
         const foundation::Lock lock(lock_);
         isEnding_ = true;
-        changed_.notifyOne();
+        wakeThread();
     }
 
     // The life of the queue's thread.
     void run()
     {
-        ThreadHeap heap([this] { wake(); });
+        ThreadHeap heap([this] {
+            const foundation::Lock lock(lock_);
+            wakeThread();
+        });
         for (Next next = waitForNext(heap); next != Next::End; next = waitForNext(heap)) {
             if (next == Next::Turn)
                 runTurn();
@@ -98,16 +99,15 @@ private:
                 return Next::Heap;
             isAsleep_ = true;
             changed_.wait(lock_);
-            isAsleep_ = false;
         }
         takeTurn();
         return Next::Turn;
     }
 
-    void wake()
+    void wakeThread() KESTO_REQUIRES(lock_)
     {
-        const foundation::Lock lock(lock_);
-        changed_.notifyOne();
+        if (std::exchange(isAsleep_, false))
+            changed_.notifyOne();
     }
 
     void takeTurn() KESTO_REQUIRES(lock_)
@@ -136,8 +136,8 @@ private:
     {
         const foundation::Lock lock(lock_);
         isTurnTaken_ = false;
-        if (isAsleep_ && (isEnding_ || !waiting_.empty()))
-            changed_.notifyOne();
+        if (isEnding_ || !waiting_.empty())
+            wakeThread();
     }
 
     const TurnEndHandler turnEndHandler_;

@@ -93,6 +93,12 @@ TEST_F(LinuxLogDescriptorTest, KeepsTextBeyondAsciiAsItIs)
     EXPECT_EQ(nextWrite(), std::string(prefix) + "Größe in µs 音量 \xf0\x9f\x8e\xb5\n");
 }
 
+TEST_F(LinuxLogDescriptorTest, LooksAtNothingBehindTheEndOfTheMessage)
+{
+    log().write(record(std::string_view("half a character\xc2\x9b").substr(0, 17)));
+    EXPECT_EQ(nextWrite(), std::string(prefix) + "half a character\xc2\n");
+}
+
 TEST_F(LinuxLogDescriptorTest, AnEmptyMessageIsALineToo)
 {
     log().write(record(""));

@@ -18,11 +18,11 @@ using testing::EndsWith;
 using testing::HasSubstr;
 using testing::Not;
 
-constexpr double noon = 1'800'000'000.25;
+constexpr double noon = 1'800'000'000.9990234375; // of the last millisecond before the next second
 
 std::string timeText()
 {
-    return foundation::localTimeText(noon, "{:%Y-%m-%d %H:%M:%S}") + ".250";
+    return foundation::localTimeText(noon, "{:%Y-%m-%d %H:%M:%S}") + ".999";
 }
 
 auto lineCount(const RecentLogLines& lines)

@@ -44,6 +44,13 @@ TEST_F(LinuxProcessTableTest, KnowsItsOwnProcess)
     EXPECT_EQ(table.ownProcessName() + "\n", support::readFile("/proc/self/comm"));
 }
 
+TEST_F(LinuxProcessTableTest, KnowsTheFirstProcessOfTheSystemAndNoneWithALowerNumber)
+{
+    EXPECT_EQ(nameOf(1).value_or("") + "\n", support::readFile("/proc/1/comm"));
+    EXPECT_EQ(nameOf(0), std::nullopt);
+    EXPECT_EQ(nameOf(-1), std::nullopt);
+}
+
 TEST_F(LinuxProcessTableTest, AProcessThatWasMissingIsLookedForAgain)
 {
     // A missing process is not cached.

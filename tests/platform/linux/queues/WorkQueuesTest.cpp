@@ -5,6 +5,7 @@
 #include "platform/linux/process/Thread.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/queues/SerialQueue.h"
+#include "platform/linux/queues/ThreadHeap.h"
 #include "support/ProcessThreads.h"
 #include "support/WatchedThread.h"
 
@@ -356,6 +357,16 @@ TEST_F(TurnsTest, TurnsOfHelpersAndOfTheQueuesThreadNeverOverlap)
     }
     queue.reset();
     EXPECT_EQ(ran, 3 * items);
+}
+
+TEST_F(TurnsTest, TheQueuesThreadWakesToTidyItsHeap)
+{
+    const std::uint64_t before = support::timesAsleep(queueThread);
+    ThreadHeap::askAll();
+    const auto deadline = std::chrono::steady_clock::now() + 20s;
+    while (support::timesAsleep(queueThread) == before && std::chrono::steady_clock::now() < deadline)
+        std::this_thread::yield();
+    EXPECT_GT(support::timesAsleep(queueThread), before);
 }
 
 TEST_F(TurnsTest, AQueueMayBeDroppedByAnItemThatAHelperRuns)

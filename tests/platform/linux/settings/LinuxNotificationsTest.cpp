@@ -242,6 +242,17 @@ TEST_F(LinuxNotificationsTest, SaysWhyTheDirectoryIsMissing)
     EXPECT_TRUE(log_.lines()[0].message.contains("File exists")) << log_.lines()[0].message;
 }
 
+TEST_F(LinuxNotificationsTest, PostsTheNamesOfFilesThatComeWithTheirDirectory)
+{
+    Posts posts;
+    (void)registerName(ringer, posts);
+    fs::create_directory(temporary_.path() / "prepared");
+    support::writeFile(temporary_.path() / "prepared" / ringer, "1");
+    fs::rename(directory_, temporary_.path() / "old");
+    fs::rename(temporary_.path() / "prepared", directory_);
+    EXPECT_TRUE(posts.waitForMoreThan(0));
+}
+
 TEST_F(LinuxNotificationsTest, GoesOnWhenItsDirectoryIsMadeAnew)
 {
     Posts posts;

@@ -5,9 +5,11 @@
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/store/EventWriter.h"
 #include "platform/linux/store/ManualClock.h"
+#include "platform/linux/store/MemoryKeeper.h"
 #include "platform/linux/store/StoreReader.h"
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
+#include "support/WatchedThread.h"
 #include "support/fakes/FakeLog.h"
 
 #include <atomic>
@@ -498,22 +500,44 @@ TEST_F(AnalyticsStoreTest, NewBoundsAreAppliedWithoutAnotherEvent)
     EXPECT_TRUE(becomesTrue([&] { return storedEvents() == 0; }));
 }
 
+// Tidies in many small steps, and says when the last of them is done.
+class SlowlyTidiedKeeper final : public support::MemoryKeeper {
+public:
+    SlowlyTidiedKeeper(const Clock& clock, std::promise<void>& done)
+        : MemoryKeeper(std::make_shared<support::KeptEvents>(), clock),
+          done_(done)
+    {
+    }
+
+    bool tidy(bool) override
+    {
+        if (--stepsLeft_ == 0)
+            done_.set_value();
+        return stepsLeft_ > 0;
+    }
+
+private:
+    std::promise<void>& done_;
+    int stepsLeft_ = 100;
+};
+
+TEST_F(AnalyticsStoreTest, TidiesToTheEndWhileItHasNothingElseToDo)
+{
+    std::promise<void> done;
+    const AnalyticsStore idle(std::make_unique<SlowlyTidiedKeeper>(clock, done), watcher, clock, ProviderLog(log));
+    EXPECT_EQ(done.get_future().wait_for(20s), std::future_status::ready);
+}
+
 TEST_F(AnalyticsStoreTest, AnIdleStoreDoesNotWake)
 {
     KESTO_SKIP_WHERE_THREADS_ARE_WATCHED();
     send(1);
     store().flush();
-    // All threads of this process except this one: the kernel counts a switch when the thread wakes.
-    const auto switches = [] {
+    const auto switches = [] { // of all threads of this process except this one
         std::uint64_t sum = 0;
-        for (const auto& task : fs::directory_iterator("/proc/self/task")) {
-            if (task.path().filename() == std::to_string(::gettid()))
-                continue;
-            std::istringstream status(support::readFile(task.path() / "status"));
-            for (std::string line; std::getline(status, line);)
-                if (line.starts_with("voluntary_ctxt_switches:"))
-                    sum += std::stoull(line.substr(line.find(':') + 1));
-        }
+        for (const auto& task : fs::directory_iterator("/proc/self/task"))
+            if (const pid_t thread = std::stoi(task.path().filename()); thread != ::gettid())
+                sum += support::timesAsleep(thread);
         return sum;
     };
     EXPECT_TRUE(becomesTrue([&] { // until both threads sleep

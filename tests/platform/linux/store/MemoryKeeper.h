@@ -37,7 +37,7 @@ private:
     std::vector<KeptEvent> events_ KESTO_GUARDED_BY(lock_);
 };
 
-class MemoryKeeper final : public platform::EventKeeper {
+class MemoryKeeper : public platform::EventKeeper {
 public:
     MemoryKeeper(std::shared_ptr<KeptEvents> place, const platform::Clock& clock)
         : place_(std::move(place)),

@@ -140,6 +140,23 @@ TEST_F(TracefsKernelTraceTest, IsOnWhileASessionRunsAndOffOtherwise)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
+TEST_F(TracefsKernelTraceTest, IsOffWhenItIsGoneEvenIfItsThreadHadNoTimeLeft)
+{
+    const auto queue = std::make_shared<SerialQueue>("trace", SerialQueueOptions());
+    for (int round = 0; round < 20; ++round) {
+        TracefsEmitter emitter;
+        EmitterAccess otherAccess;
+        {
+            TracefsKernelTrace other({.mounts = tree.mounts, .instanceName = "kesto"}, emitter, otherAccess,
+                                     ProviderLog(log));
+            const auto session = other.createTraceSession();
+            ASSERT_NE(session, nullptr);
+            ASSERT_EQ(session->start(queue), 0);
+        }
+        EXPECT_EQ(tree.content("tracing_on"), "0");
+    }
+}
+
 TEST_F(TracefsKernelTraceTest, ReadsWithThePriorityOfWhatSomebodyWaitsFor)
 {
     const int own = ::getpriority(PRIO_PROCESS, 0);
