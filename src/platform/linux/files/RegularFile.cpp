@@ -5,6 +5,7 @@
 
 #include <algorithm>
 #include <array>
+#include <cerrno>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -21,6 +22,8 @@ std::expected<std::string, std::error_code> readRegularFile(const FileDescriptor
     std::string bytes;
     for (;;) {
         const ssize_t count = ::read(file.get(), piece.data(), std::min(piece.size(), most - bytes.size()));
+        if (count < 0 && errno == EINTR) // file systems in user space may be interrupted
+            continue;
         if (count < 0)
             return std::unexpected(systemError());
         if (count == 0) // at the end of the file, or because no more was asked for
