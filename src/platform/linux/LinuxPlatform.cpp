@@ -2,7 +2,7 @@
 // happens at the end of a turn.
 #include "platform/linux/LinuxPlatform.h"
 
-#include "platform/linux/store/EventWriter.h"
+#include "platform/linux/store/SqliteKeeper.h"
 
 namespace platform {
 namespace {
@@ -39,8 +39,8 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
                   ProviderLog(log_)),
       kernelTrace_(TracefsPlace(), traceEmitter_, emitterAccess_, ProviderLog(log_)),
       performanceWriter_(fileSystem_, ProviderLog(log_)),
-      analytics_(std::make_unique<EventWriter>(launch.stateDirectory, clock_, ProviderLog(log_)), configurationWatcher_,
-                 clock_, ProviderLog(log_))
+      analytics_(std::make_unique<SqliteKeeper>(launch.stateDirectory, clock_, ProviderLog(log_)),
+                 configurationWatcher_, clock_, ProviderLog(log_))
 {
     preferences_.setChangeHandler([this](std::string_view domain) { notifications_.post(notificationOf(domain)); });
     // The replies of a turn leave once its events are kept.

@@ -3,8 +3,8 @@
 #include "platform/contract/Contract.h"
 #include "platform/linux/process/LinuxClock.h"
 #include "platform/linux/store/AnalyticsStore.h"
-#include "platform/linux/store/EventWriter.h"
 #include "platform/linux/store/MemoryKeeper.h"
+#include "platform/linux/store/SqliteKeeper.h"
 #include "platform/linux/store/StoreReader.h"
 #include "support/ParseJson.h"
 #include "support/TemporaryDirectory.h"
@@ -95,11 +95,11 @@ class LinuxAnalyticsSubject final : public StoreSubject {
 private:
     [[nodiscard]] std::unique_ptr<platform::EventKeeper> makeKeeper() override
     {
-        return std::make_unique<platform::EventWriter>(directory_.path(), clock_, platform::ProviderLog(log_));
+        return std::make_unique<platform::SqliteKeeper>(directory_.path(), clock_, platform::ProviderLog(log_));
     }
     [[nodiscard]] std::vector<AnalyticsEvent> kept() override
     {
-        support::StoreReader reader(directory_ / platform::EventWriter::fileName);
+        support::StoreReader reader(directory_ / platform::SqliteKeeper::fileName);
         const auto names = reader.texts("SELECT name FROM events ORDER BY rowid");
         const auto payloads = reader.texts("SELECT payload FROM events ORDER BY rowid");
         std::vector<AnalyticsEvent> events;

@@ -1,9 +1,9 @@
 // The contract of platform/linux/store/EventKeeper.h: kept events stay in their order, and those that are too old or
 // too many are removed.
 #include "platform/contract/Contract.h"
-#include "platform/linux/store/EventWriter.h"
 #include "platform/linux/store/ManualClock.h"
 #include "platform/linux/store/MemoryKeeper.h"
+#include "platform/linux/store/SqliteKeeper.h"
 #include "platform/linux/store/StoreReader.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
@@ -66,14 +66,14 @@ public:
     void close() override { keeper_.reset(); }
     [[nodiscard]] std::vector<std::string> payloads() override
     {
-        return support::StoreReader(directory_ / platform::EventWriter::fileName)
+        return support::StoreReader(directory_ / platform::SqliteKeeper::fileName)
             .texts("SELECT payload FROM events ORDER BY id");
     }
 
 private:
     const support::TemporaryDirectory directory_;
     support::FakeLog log_;
-    std::optional<platform::EventWriter> keeper_;
+    std::optional<platform::SqliteKeeper> keeper_;
 };
 
 class EventKeeperContract : public Suite<EventKeeperSubject> {

@@ -3,9 +3,9 @@
 #include "platform/linux/store/AnalyticsStore.h"
 
 #include "platform/linux/queues/LinuxWorkQueues.h"
-#include "platform/linux/store/EventWriter.h"
 #include "platform/linux/store/ManualClock.h"
 #include "platform/linux/store/MemoryKeeper.h"
+#include "platform/linux/store/SqliteKeeper.h"
 #include "platform/linux/store/StoreReader.h"
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
@@ -45,7 +45,7 @@ protected:
     {
         if (!store_)
             store_ = std::make_unique<AnalyticsStore>(
-                std::make_unique<EventWriter>(temporary.path(), clock, ProviderLog(log)), watcher, clock,
+                std::make_unique<SqliteKeeper>(temporary.path(), clock, ProviderLog(log)), watcher, clock,
                 ProviderLog(log), limits);
         return *store_;
     }
@@ -408,8 +408,8 @@ TEST_F(AnalyticsStoreTest, KillingTheServiceLosesNothingThatWasAcknowledged)
         const pid_t service = ::fork();
         if (service == 0) {
             ConfigurationWatcher childsWatcher(directory, ProviderLog(log));
-            AnalyticsStore childsStore(std::make_unique<EventWriter>(directory, clock, ProviderLog(log)), childsWatcher,
-                                       clock, ProviderLog(log));
+            AnalyticsStore childsStore(std::make_unique<SqliteKeeper>(directory, clock, ProviderLog(log)),
+                                       childsWatcher, clock, ProviderLog(log));
             Turn turn;
             for (std::int64_t number = 1;; ++number) {
                 childsStore.sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });

@@ -25,7 +25,7 @@ struct sqlite3_stmt;
 namespace platform {
 
 // One thread at a time.
-class EventDatabase {
+class SqliteEventFile {
 public:
     template <typename Result = void> using Expected = std::expected<Result, StoreError>;
 
@@ -37,10 +37,10 @@ public:
     static constexpr std::chrono::milliseconds longestWaitForLock{2000};
 
     // Opens the file, or makes it. A file that is corrupt or of a later version stays as it is.
-    [[nodiscard]] static Expected<std::unique_ptr<EventDatabase>> open(const std::filesystem::path& path);
-    EventDatabase(const EventDatabase&) = delete;
-    EventDatabase& operator=(const EventDatabase&) = delete;
-    ~EventDatabase();
+    [[nodiscard]] static Expected<std::unique_ptr<SqliteEventFile>> open(const std::filesystem::path& path);
+    SqliteEventFile(const SqliteEventFile&) = delete;
+    SqliteEventFile& operator=(const SqliteEventFile&) = delete;
+    ~SqliteEventFile();
 
     // Whether the path now leads to another file or to none, so that no reader finds what is written here.
     [[nodiscard]] bool wasReplaced() const;
@@ -81,7 +81,7 @@ private:
     };
     using Statement = std::unique_ptr<sqlite3_stmt, FinalizeStatement>;
 
-    explicit EventDatabase(std::filesystem::path path) : path_(std::move(path)) { }
+    explicit SqliteEventFile(std::filesystem::path path) : path_(std::move(path)) { }
     [[nodiscard]] Expected<> lockDirectory();
     [[nodiscard]] Expected<> connect();
     [[nodiscard]] Expected<> checkOrMakeSchema();

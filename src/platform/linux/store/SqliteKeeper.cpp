@@ -1,6 +1,6 @@
-// What to do when the database fails: try again later, set it aside, or count the loss. The writer never gives up for
+// What to do when the database fails: try again later, set it aside, or count the loss. The keeper never gives up for
 // good.
-#include "platform/linux/store/EventWriter.h"
+#include "platform/linux/store/SqliteKeeper.h"
 
 #include <algorithm>
 #include <array>
@@ -31,7 +31,7 @@ constexpr std::array<std::string_view, 2> companions = {"-wal", "-shm"};
 
 } // namespace
 
-EventWriter::EventWriter(const fs::path& directory, const Clock& clock, ProviderLog log)
+SqliteKeeper::SqliteKeeper(const fs::path& directory, const Clock& clock, ProviderLog log)
     : path_(directory / fileName),
       clock_(clock),
       log_(log),
@@ -39,7 +39,7 @@ EventWriter::EventWriter(const fs::path& directory, const Clock& clock, Provider
 {
 }
 
-void EventWriter::setConfiguration(const AnalyticsConfiguration& configuration)
+void SqliteKeeper::setConfiguration(const AnalyticsConfiguration& configuration)
 {
     configuration_ = configuration;
     hasMoreToTidy_ = true; // the new limits may be lower
@@ -48,14 +48,14 @@ void EventWriter::setConfiguration(const AnalyticsConfiguration& configuration)
             handleFailure(done.error());
 }
 
-std::uint64_t EventWriter::maximumBytes() const noexcept
+std::uint64_t SqliteKeeper::maximumBytes() const noexcept
 {
     return configuration_.maximumSizeMegabytes * 1024 * 1024;
 }
 
 // --- Opening
 
-void EventWriter::open()
+void SqliteKeeper::open()
 {
     if (const auto done = ensureOpen(); !done) {
         const auto [problem, remedy] = words(done.error());
@@ -63,7 +63,7 @@ void EventWriter::open()
     }
 }
 
-EventWriter::Expected<> EventWriter::ensureOpen()
+SqliteKeeper::Expected<> SqliteKeeper::ensureOpen()
 {
     if (database_ && !database_->wasReplaced())
         return {};
@@ -82,12 +82,12 @@ EventWriter::Expected<> EventWriter::ensureOpen()
     return done;
 }
 
-EventWriter::Expected<> EventWriter::openAnew()
+SqliteKeeper::Expected<> SqliteKeeper::openAnew()
 {
-    auto opened = EventDatabase::open(path_);
+    auto opened = SqliteEventFile::open(path_);
     if (!opened && (opened.error() == StoreError::Corrupt || opened.error() == StoreError::Newer)
         && setAside(opened.error()))
-        opened = EventDatabase::open(path_);
+        opened = SqliteEventFile::open(path_);
     if (!opened)
         return std::unexpected(opened.error());
     database_ = std::move(*opened);
@@ -96,7 +96,7 @@ EventWriter::Expected<> EventWriter::openAnew()
 }
 
 // Renames the database, which must be closed. One of a later version is good, so it is never removed.
-bool EventWriter::setAside(StoreError reason)
+bool SqliteKeeper::setAside(StoreError reason)
 {
     const bool isNewer = reason == StoreError::Newer;
     if (!isNewer)
@@ -122,7 +122,7 @@ bool EventWriter::setAside(StoreError reason)
     return true;
 }
 
-void EventWriter::removeOldestDamaged()
+void SqliteKeeper::removeOldestDamaged()
 {
     std::set<fs::path> damaged; // oldest first, because the time is in the name
     std::error_code error;
@@ -142,7 +142,7 @@ void EventWriter::removeOldestDamaged()
 
 // --- Keeping
 
-void EventWriter::keep(EventBatch& events)
+void SqliteKeeper::keep(EventBatch& events)
 {
     if (events.size() == 0)
         return;
@@ -158,7 +158,7 @@ void EventWriter::keep(EventBatch& events)
     losses_.report();
 }
 
-EventWriter::Expected<> EventWriter::write(std::span<const EventRow> rows)
+SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows)
 {
     const auto writeAll = [&]() -> Expected<> {
         if (const auto done = ensureOpen(); !done)
@@ -181,7 +181,7 @@ EventWriter::Expected<> EventWriter::write(std::span<const EventRow> rows)
     return done;
 }
 
-void EventWriter::handleFailure(StoreError error)
+void SqliteKeeper::handleFailure(StoreError error)
 {
     if (database_)
         database_->rollBack();
@@ -195,12 +195,12 @@ void EventWriter::handleFailure(StoreError error)
 
 // --- Housekeeping
 
-bool EventWriter::awaitsQuiet() const
+bool SqliteKeeper::awaitsQuiet() const
 {
     return database_ && isLogLongerBy(logBytesBetweenCheckpoints);
 }
 
-bool EventWriter::tidy(bool isQuiet)
+bool SqliteKeeper::tidy(bool isQuiet)
 {
     losses_.report();
     if (!database_)
@@ -216,12 +216,12 @@ bool EventWriter::tidy(bool isQuiet)
 }
 
 // Longer than at the last checkpoint.
-bool EventWriter::isLogLongerBy(std::uint64_t bytes) const
+bool SqliteKeeper::isLogLongerBy(std::uint64_t bytes) const
 {
     return database_->logBytes() >= logBytesAtCheckpoint_ + std::min(bytes, maximumBytes() / 4);
 }
 
-bool EventWriter::emptyLog()
+bool SqliteKeeper::emptyLog()
 {
     const double now = clock_.systemUptime();
     const bool waits = database_->logBytes() > maximumBytes() / 2 && now >= waitForReadersAt_;
@@ -234,12 +234,12 @@ bool EventWriter::emptyLog()
 
 // Frees more room than events have taken since the last call, so that it keeps up, but only a part of all that is due.
 // True if more is left to do.
-bool EventWriter::makeRoom()
+bool SqliteKeeper::makeRoom()
 {
     const std::uint64_t mostFreed = 2 * std::exchange(bytesSinceCheck_, 0) + bytesTidiedAtOnce;
     checkedAt_ = clock_.systemUptime();
     // Deleting turns used room into free room, and shrinking turns free room into none.
-    const auto room = [](const EventDatabase::Size& size) { return 2 * size.usedBytes + size.freeBytes; };
+    const auto room = [](const SqliteEventFile::Size& size) { return 2 * size.usedBytes + size.freeBytes; };
     auto size = database_->size();
     const std::uint64_t roomBefore = size ? room(*size) : 0;
     while (size && room(*size) + mostFreed > roomBefore) {
@@ -254,7 +254,7 @@ bool EventWriter::makeRoom()
 }
 
 // False if nothing is left to do.
-EventWriter::Expected<bool> EventWriter::makeSomeRoom(const EventDatabase::Size& size)
+SqliteKeeper::Expected<bool> SqliteKeeper::makeSomeRoom(const SqliteEventFile::Size& size)
 {
     const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
     const auto deleted = size.usedBytes > maximumBytes()

@@ -1,5 +1,5 @@
 // The only file that uses SQLite's interface. It reduces SQLite's errors to the few kinds that an owner can act on.
-#include "platform/linux/store/EventDatabase.h"
+#include "platform/linux/store/SqliteEventFile.h"
 
 #include <cassert>
 #include <cerrno>
@@ -60,32 +60,33 @@ int count(std::size_t length)
 
 } // namespace
 
-void EventDatabase::CloseConnection::operator()(sqlite3* connection) const noexcept
+void SqliteEventFile::CloseConnection::operator()(sqlite3* connection) const noexcept
 {
     ::sqlite3_close(connection);
 }
 
-void EventDatabase::FinalizeStatement::operator()(sqlite3_stmt* statement) const noexcept
+void SqliteEventFile::FinalizeStatement::operator()(sqlite3_stmt* statement) const noexcept
 {
     ::sqlite3_finalize(statement);
 }
 
-EventDatabase::~EventDatabase() = default;
+SqliteEventFile::~SqliteEventFile() = default;
 
 // --- Opening
 
-EventDatabase::Expected<std::unique_ptr<EventDatabase>> EventDatabase::open(const std::filesystem::path& path)
+SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>> SqliteEventFile::open(const std::filesystem::path& path)
 {
-    std::unique_ptr<EventDatabase> database(new EventDatabase(path));
-    for (const auto step : {&EventDatabase::lockDirectory, &EventDatabase::connect, &EventDatabase::checkOrMakeSchema,
-                            &EventDatabase::configure, &EventDatabase::prepareStatements})
+    std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path));
+    for (const auto step :
+         {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::checkOrMakeSchema,
+          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements})
         if (const auto done = (*database.*step)(); !done)
             return std::unexpected(done.error());
     return database;
 }
 
 // The lock is not on the file itself: closing any descriptor of the file would release SQLite's own locks.
-EventDatabase::Expected<> EventDatabase::lockDirectory()
+SqliteEventFile::Expected<> SqliteEventFile::lockDirectory()
 {
     directoryLock_ = FileDescriptor(::open(path_.parent_path().c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
     if (!directoryLock_)
@@ -95,7 +96,7 @@ EventDatabase::Expected<> EventDatabase::lockDirectory()
     return {};
 }
 
-EventDatabase::Expected<> EventDatabase::connect()
+SqliteEventFile::Expected<> SqliteEventFile::connect()
 {
     sqlite3* connection = nullptr;
     const int opened = ::sqlite3_open_v2(path_.c_str(), &connection,
@@ -115,7 +116,7 @@ EventDatabase::Expected<> EventDatabase::connect()
     return {};
 }
 
-EventDatabase::Expected<> EventDatabase::checkOrMakeSchema()
+SqliteEventFile::Expected<> SqliteEventFile::checkOrMakeSchema()
 {
     const auto version = number("PRAGMA user_version");
     const auto objects = version ? number("SELECT count(*) FROM sqlite_schema") : version;
@@ -138,7 +139,7 @@ EventDatabase::Expected<> EventDatabase::checkOrMakeSchema()
                    "COMMIT");
 }
 
-EventDatabase::Expected<> EventDatabase::configure()
+SqliteEventFile::Expected<> SqliteEventFile::configure()
 {
     const auto pageSize = number("PRAGMA page_size");
     if (!pageSize)
@@ -151,14 +152,14 @@ EventDatabase::Expected<> EventDatabase::configure()
     int keepLog = 1;
     ::sqlite3_file_control(connection_.get(), "main", SQLITE_FCNTL_PERSIST_WAL, &keepLog);
     const auto noteLog = [](void* database, sqlite3*, const char*, int pages) {
-        static_cast<EventDatabase*>(database)->logPages_ = static_cast<std::uint64_t>(pages);
+        static_cast<SqliteEventFile*>(database)->logPages_ = static_cast<std::uint64_t>(pages);
         return SQLITE_OK;
     };
     ::sqlite3_wal_hook(connection_.get(), noteLog, this); // in place of SQLite's automatic checkpoints
     return execute(fmt::format("PRAGMA journal_size_limit = {}", mostLogKept).c_str());
 }
 
-EventDatabase::Expected<> EventDatabase::beginLog()
+SqliteEventFile::Expected<> SqliteEventFile::beginLog()
 {
     const auto statement = prepare("PRAGMA journal_mode = WAL");
     if (!statement)
@@ -171,7 +172,7 @@ EventDatabase::Expected<> EventDatabase::beginLog()
     return {};
 }
 
-EventDatabase::Expected<> EventDatabase::prepareStatements()
+SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
 {
     const std::string insertOne = "INSERT INTO events(time, name, payload) VALUES (?, ?, ?)";
     std::string insertMany = insertOne;
@@ -195,13 +196,13 @@ EventDatabase::Expected<> EventDatabase::prepareStatements()
     return {};
 }
 
-bool EventDatabase::wasReplaced() const
+bool SqliteEventFile::wasReplaced() const
 {
     struct stat status = {};
     return ::stat(path_.c_str(), &status) != 0 || status.st_dev != device_ || status.st_ino != inode_;
 }
 
-EventDatabase::Expected<> EventDatabase::setSynchronization(StoreSynchronization synchronization)
+SqliteEventFile::Expected<> SqliteEventFile::setSynchronization(StoreSynchronization synchronization)
 {
     return execute(synchronization == StoreSynchronization::Full ? "PRAGMA synchronous = FULL"
                                                                  : "PRAGMA synchronous = NORMAL");
@@ -209,12 +210,12 @@ EventDatabase::Expected<> EventDatabase::setSynchronization(StoreSynchronization
 
 // --- Writing
 
-EventDatabase::Expected<> EventDatabase::begin()
+SqliteEventFile::Expected<> SqliteEventFile::begin()
 {
     return run(begin_);
 }
 
-EventDatabase::Expected<> EventDatabase::insert(std::span<const EventRow> rows)
+SqliteEventFile::Expected<> SqliteEventFile::insert(std::span<const EventRow> rows)
 {
     while (!rows.empty()) {
         const std::size_t number = rows.size() >= rowsAtOnce ? rowsAtOnce : 1;
@@ -229,7 +230,7 @@ EventDatabase::Expected<> EventDatabase::insert(std::span<const EventRow> rows)
 }
 
 // The statement refers to the texts, so they must stay in place until it has run.
-void EventDatabase::bind(const Statement& statement, int firstParameter, const EventRow& row)
+void SqliteEventFile::bind(const Statement& statement, int firstParameter, const EventRow& row)
 {
     const auto bindText = [&statement](int parameter, std::string_view text) {
         return ::sqlite3_bind_text(statement.get(), parameter, text.data(), count(text.size()), SQLITE_STATIC)
@@ -241,12 +242,12 @@ void EventDatabase::bind(const Statement& statement, int firstParameter, const E
     assert(areBound);
 }
 
-EventDatabase::Expected<> EventDatabase::commit()
+SqliteEventFile::Expected<> SqliteEventFile::commit()
 {
     return run(commit_);
 }
 
-void EventDatabase::rollBack()
+void SqliteEventFile::rollBack()
 {
     if (::sqlite3_get_autocommit(connection_.get()) == 0)
         ::sqlite3_exec(connection_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
@@ -254,7 +255,7 @@ void EventDatabase::rollBack()
 
 // --- Limits
 
-bool EventDatabase::emptyLog(std::chrono::milliseconds wait)
+bool SqliteEventFile::emptyLog(std::chrono::milliseconds wait)
 {
     ::sqlite3_busy_timeout(connection_.get(), count(wait.count()));
     const int done =
@@ -265,7 +266,7 @@ bool EventDatabase::emptyLog(std::chrono::milliseconds wait)
     return done == SQLITE_OK;
 }
 
-EventDatabase::Expected<EventDatabase::Size> EventDatabase::size()
+SqliteEventFile::Expected<SqliteEventFile::Size> SqliteEventFile::size()
 {
     const auto pages = number("PRAGMA page_count");
     const auto free = pages ? number("PRAGMA freelist_count") : pages;
@@ -275,14 +276,14 @@ EventDatabase::Expected<EventDatabase::Size> EventDatabase::size()
                 .freeBytes = static_cast<std::uint64_t>(*free) * pageSize_};
 }
 
-EventDatabase::Expected<std::uint64_t> EventDatabase::deleteBefore(double time, std::uint64_t most)
+SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteBefore(double time, std::uint64_t most)
 {
     ::sqlite3_bind_double(deleteBefore_.get(), 1, time);
     ::sqlite3_bind_int64(deleteBefore_.get(), 2, static_cast<std::int64_t>(most));
     return runAndCountChanges(deleteBefore_);
 }
 
-EventDatabase::Expected<std::uint64_t> EventDatabase::deleteOldest(std::uint64_t bytes, std::uint64_t most)
+SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOldest(std::uint64_t bytes, std::uint64_t most)
 {
     ::sqlite3_bind_int64(sizesOfOldest_.get(), 1, static_cast<std::int64_t>(most));
     std::int64_t last = 0;
@@ -302,26 +303,26 @@ EventDatabase::Expected<std::uint64_t> EventDatabase::deleteOldest(std::uint64_t
     return runAndCountChanges(deleteUpTo_);
 }
 
-EventDatabase::Expected<> EventDatabase::shrink(std::uint64_t mostBytes)
+SqliteEventFile::Expected<> SqliteEventFile::shrink(std::uint64_t mostBytes)
 {
     return execute(fmt::format("PRAGMA incremental_vacuum({})", mostBytes / pageSize_).c_str());
 }
 
 // --- SQLite
 
-StoreError EventDatabase::lastError() const
+StoreError SqliteEventFile::lastError() const
 {
     return errorOf(connection_.get());
 }
 
-EventDatabase::Expected<> EventDatabase::execute(const char* sql)
+SqliteEventFile::Expected<> SqliteEventFile::execute(const char* sql)
 {
     if (::sqlite3_exec(connection_.get(), sql, nullptr, nullptr, nullptr) == SQLITE_OK)
         return {};
     return std::unexpected(lastError());
 }
 
-EventDatabase::Expected<std::int64_t> EventDatabase::number(const char* sql)
+SqliteEventFile::Expected<std::int64_t> SqliteEventFile::number(const char* sql)
 {
     const auto statement = prepare(sql);
     if (!statement)
@@ -331,7 +332,7 @@ EventDatabase::Expected<std::int64_t> EventDatabase::number(const char* sql)
     return ::sqlite3_column_int64(statement->get(), 0);
 }
 
-EventDatabase::Expected<EventDatabase::Statement> EventDatabase::prepare(std::string_view sql)
+SqliteEventFile::Expected<SqliteEventFile::Statement> SqliteEventFile::prepare(std::string_view sql)
 {
     sqlite3_stmt* statement = nullptr;
     if (::sqlite3_prepare_v3(connection_.get(), sql.data(), count(sql.size()), SQLITE_PREPARE_PERSISTENT, &statement,
@@ -341,7 +342,7 @@ EventDatabase::Expected<EventDatabase::Statement> EventDatabase::prepare(std::st
     return Statement(statement);
 }
 
-EventDatabase::Expected<> EventDatabase::run(const Statement& statement)
+SqliteEventFile::Expected<> SqliteEventFile::run(const Statement& statement)
 {
     const int done = ::sqlite3_step(statement.get());
     if (done == SQLITE_DONE || done == SQLITE_ROW) {
@@ -353,7 +354,7 @@ EventDatabase::Expected<> EventDatabase::run(const Statement& statement)
     return std::unexpected(error);
 }
 
-EventDatabase::Expected<std::uint64_t> EventDatabase::runAndCountChanges(const Statement& statement)
+SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::runAndCountChanges(const Statement& statement)
 {
     if (const auto done = run(statement); !done)
         return std::unexpected(done.error());

@@ -4,9 +4,9 @@
 
 #include "platform/Clock.h"
 #include "platform/linux/log/ProviderLog.h"
-#include "platform/linux/store/EventDatabase.h"
 #include "platform/linux/store/EventKeeper.h"
 #include "platform/linux/store/EventLosses.h"
+#include "platform/linux/store/SqliteEventFile.h"
 
 #include <atomic>
 #include <cstdint>
@@ -18,7 +18,7 @@
 namespace platform {
 
 // One thread, except for the counts.
-class EventWriter final : public EventKeeper {
+class SqliteKeeper final : public EventKeeper {
 public:
     static constexpr std::string_view fileName = "analytics.sqlite3";
     static constexpr std::size_t mostDamagedKept = 3; // databases set aside; older ones are removed
@@ -39,7 +39,7 @@ public:
     static constexpr double secondsBetweenChecks = 60;
     static constexpr std::uint64_t eventsDeletedAtOnce = 512;
 
-    EventWriter(const std::filesystem::path& directory, const Clock& clock, ProviderLog log);
+    SqliteKeeper(const std::filesystem::path& directory, const Clock& clock, ProviderLog log);
 
     void setConfiguration(const AnalyticsConfiguration& configuration) override;
 
@@ -52,7 +52,7 @@ public:
     [[nodiscard]] std::uint64_t lostEvents(StoreError reason) const noexcept override { return losses_.count(reason); }
 
 private:
-    template <typename Result = void> using Expected = EventDatabase::Expected<Result>;
+    template <typename Result = void> using Expected = SqliteEventFile::Expected<Result>;
 
     [[nodiscard]] Expected<> ensureOpen();
     [[nodiscard]] Expected<> openAnew();
@@ -63,7 +63,7 @@ private:
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     bool emptyLog();
     [[nodiscard]] bool makeRoom();
-    [[nodiscard]] Expected<bool> makeSomeRoom(const EventDatabase::Size& size);
+    [[nodiscard]] Expected<bool> makeSomeRoom(const SqliteEventFile::Size& size);
     [[nodiscard]] std::uint64_t maximumBytes() const noexcept;
 
     const std::filesystem::path path_;
@@ -73,7 +73,7 @@ private:
     EventLosses losses_;
     std::atomic<std::uint64_t> kept_ = 0;
 
-    std::unique_ptr<EventDatabase> database_; // null: could not be opened
+    std::unique_ptr<SqliteEventFile> database_; // null: could not be opened
     StoreError openError_ = StoreError::Other;
     double openAgainAt_ = 0; // here and below: uptime, in seconds
     std::uint64_t logBytesAtCheckpoint_ = 0;

@@ -1,6 +1,6 @@
 // The database on disks that are full, read-only or damaged, beside readers and other writers, and within its limits:
 // events may be lost, but are counted, and the service goes on.
-#include "platform/linux/store/EventWriter.h"
+#include "platform/linux/store/SqliteKeeper.h"
 
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/store/ManualClock.h"
@@ -72,28 +72,28 @@ std::vector<PlainEvent> events(std::size_t count, std::size_t payloadSize = 300,
     return std::vector<PlainEvent>(count, event(time, "com.quarn.kesto.Playback.Start", payload));
 }
 
-class EventWriterTest : public testing::Test {
+class SqliteKeeperTest : public testing::Test {
 protected:
-    EventWriter& writer()
+    SqliteKeeper& keeper()
     {
-        if (!writer_) {
-            writer_ = std::make_unique<EventWriter>(directory, clock, ProviderLog(log));
-            writer_->setConfiguration(configuration);
+        if (!keeper_) {
+            keeper_ = std::make_unique<SqliteKeeper>(directory, clock, ProviderLog(log));
+            keeper_->setConfiguration(configuration);
         }
-        return *writer_;
+        return *keeper_;
     }
-    void closeWriter() { writer_.reset(); }
-    static void keepIn(EventWriter& writer, const std::vector<PlainEvent>& given)
+    void closeWriter() { keeper_.reset(); }
+    static void keepIn(SqliteKeeper& keeper, const std::vector<PlainEvent>& given)
     {
         EventBatch batch;
         for (const auto& [time, name, payload] : given)
             batch.add(time, name, payload);
-        writer.keep(batch);
+        keeper.keep(batch);
     }
-    void keep(const std::vector<PlainEvent>& given) { keepIn(writer(), given); }
+    void keep(const std::vector<PlainEvent>& given) { keepIn(keeper(), given); }
     void maintain(bool isQuiet = true)
     {
-        while (writer().tidy(isQuiet)) { }
+        while (keeper().tidy(isQuiet)) { }
     }
     std::uint64_t logBytes() const { return fs::file_size(directory / "analytics.sqlite3-wal"); }
     [[nodiscard]] std::vector<std::string> filesNamed(std::string_view part) const
@@ -105,7 +105,7 @@ protected:
         std::ranges::sort(names);
         return names;
     }
-    std::uint64_t lost(StoreError reason) { return writer().lostEvents(reason); }
+    std::uint64_t lost(StoreError reason) { return keeper().lostEvents(reason); }
 
     support::TemporaryDirectory temporary;
     fs::path directory = temporary.path();
@@ -115,14 +115,14 @@ protected:
     AnalyticsConfiguration configuration;
 
 private:
-    std::unique_ptr<EventWriter> writer_;
+    std::unique_ptr<SqliteKeeper> keeper_;
 };
 
 // --- The database
 
-TEST_F(EventWriterTest, TheSchemaIsTheOneThatIsPromised)
+TEST_F(SqliteKeeperTest, TheSchemaIsTheOneThatIsPromised)
 {
-    writer().open();
+    keeper().open();
     StoreReader reader(file());
     EXPECT_EQ(
         reader.text("SELECT sql FROM sqlite_schema WHERE name = 'events'"),
@@ -133,7 +133,7 @@ TEST_F(EventWriterTest, TheSchemaIsTheOneThatIsPromised)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(EventWriterTest, KeepsEventsInTheirOrder)
+TEST_F(SqliteKeeperTest, KeepsEventsInTheirOrder)
 {
     keep({event(1'800'000'000.25, "a", {{"n", 1}, {"text", "x\"y\n"}}), event(1'700'000'000, "b", {})});
     keep({event(1'800'000'001, "c", {{"yes", true}, {"share", 0.6F}})});
@@ -141,10 +141,10 @@ TEST_F(EventWriterTest, KeepsEventsInTheirOrder)
     EXPECT_THAT(reader.texts("SELECT id || ' ' || time || ' ' || name || ' ' || payload FROM events ORDER BY id"),
                 ElementsAre("1 1800000000.25 a {\"n\":1,\"text\":\"x\\\"y\\n\"}", "2 1700000000.0 b {}",
                             "3 1800000001.0 c {\"yes\":true,\"share\":0.6}"));
-    EXPECT_EQ(writer().keptEvents(), 3U);
+    EXPECT_EQ(keeper().keptEvents(), 3U);
 }
 
-TEST_F(EventWriterTest, NumbersOfRowsOnEverySideOfTheStatementsSize)
+TEST_F(SqliteKeeperTest, NumbersOfRowsOnEverySideOfTheStatementsSize)
 {
     std::int64_t expected = 0;
     for (const std::size_t count : {1U, 15U, 16U, 17U, 31U, 32U, 33U, 100U}) {
@@ -161,7 +161,7 @@ TEST_F(EventWriterTest, NumbersOfRowsOnEverySideOfTheStatementsSize)
     }
 }
 
-TEST_F(EventWriterTest, TwoEventsOfOnePayloadBothHaveIt)
+TEST_F(SqliteKeeperTest, TwoEventsOfOnePayloadBothHaveIt)
 {
     const Dictionary shared{{"n", 1}};
     keep({event(1, "a", shared), event(1, "b", shared), event(1, "c", {{"n", 2}}), event(1, "d", shared)});
@@ -170,18 +170,18 @@ TEST_F(EventWriterTest, TwoEventsOfOnePayloadBothHaveIt)
                 ElementsAre("a{\"n\":1}", "b{\"n\":1}", "c{\"n\":2}", "d{\"n\":1}"));
 }
 
-TEST_F(EventWriterTest, NumbersAreNeverUsedTwice)
+TEST_F(SqliteKeeperTest, NumbersAreNeverUsedTwice)
 {
     keep({event(1), event(2)});
     configuration.maximumAgeDays = 1;
-    writer().setConfiguration(configuration);
+    keeper().setConfiguration(configuration);
     maintain();
     closeWriter();
     keep({event(3)});
     EXPECT_EQ(StoreReader(file()).text("SELECT id FROM events"), "3");
 }
 
-TEST_F(EventWriterTest, GoesOnWithTheDatabaseThatIsThere)
+TEST_F(SqliteKeeperTest, GoesOnWithTheDatabaseThatIsThere)
 {
     keep({event(1, "a")});
     closeWriter();
@@ -190,7 +190,7 @@ TEST_F(EventWriterTest, GoesOnWithTheDatabaseThatIsThere)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(EventWriterTest, AnEmptyFileIsANewDatabase)
+TEST_F(SqliteKeeperTest, AnEmptyFileIsANewDatabase)
 {
     support::writeFile(file(), "");
     keep({event(1)});
@@ -198,7 +198,7 @@ TEST_F(EventWriterTest, AnEmptyFileIsANewDatabase)
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(EventWriterTest, WhatJsonCannotSayIsLostAndNothingElse)
+TEST_F(SqliteKeeperTest, WhatJsonCannotSayIsLostAndNothingElse)
 {
     const double infinity = std::numeric_limits<double>::infinity();
     keep({event(1, "a"), event(1, "b", {{"n", infinity}}), event(1, "c", {{"n", foundation::Array{1, -infinity}}}),
@@ -206,7 +206,7 @@ TEST_F(EventWriterTest, WhatJsonCannotSayIsLostAndNothingElse)
     EXPECT_THAT(StoreReader(file()).texts("SELECT name || payload FROM events ORDER BY id"),
                 ElementsAre("a{\"key\":1}", "e{\"key\":1}"));
     EXPECT_EQ(lost(StoreError::NotJson), 3U);
-    EXPECT_EQ(writer().keptEvents(), 2U);
+    EXPECT_EQ(keeper().keptEvents(), 2U);
     EXPECT_THAT(log.take(),
                 ElementsAre(support::IsLine(LogLevel::Error, "kerl",
                                             "3 analytics events were lost (3 since the start): " + file().string()
@@ -214,7 +214,7 @@ TEST_F(EventWriterTest, WhatJsonCannotSayIsLostAndNothingElse)
                                                   "correct the programs that send them")));
 }
 
-TEST_F(EventWriterTest, AnEventAfterOneThatIsNotJsonDoesNotGetItsPayload)
+TEST_F(SqliteKeeperTest, AnEventAfterOneThatIsNotJsonDoesNotGetItsPayload)
 {
     const Dictionary bad{{"n", std::numeric_limits<double>::quiet_NaN()}};
     keep({event(1, "a", bad), event(1, "b", bad), event(1, "c", {{"n", 1}})});
@@ -222,7 +222,7 @@ TEST_F(EventWriterTest, AnEventAfterOneThatIsNotJsonDoesNotGetItsPayload)
     EXPECT_EQ(lost(StoreError::NotJson), 2U);
 }
 
-TEST_F(EventWriterTest, FullSynchronizationIsSetAndTakenBack)
+TEST_F(SqliteKeeperTest, FullSynchronizationIsSetAndTakenBack)
 {
     const auto synchronizationsOfACommit = [this] {
         keep({event(1)}); // the first commit of a log differs from the others
@@ -232,16 +232,16 @@ TEST_F(EventWriterTest, FullSynchronizationIsSetAndTakenBack)
     };
     EXPECT_EQ(synchronizationsOfACommit(), 0);
     configuration.synchronization = StoreSynchronization::Full;
-    writer().setConfiguration(configuration);
+    keeper().setConfiguration(configuration);
     EXPECT_EQ(synchronizationsOfACommit(), 1);
     closeWriter();
     EXPECT_EQ(synchronizationsOfACommit(), 1) << "from the beginning";
     configuration.synchronization = StoreSynchronization::Normal;
-    writer().setConfiguration(configuration);
+    keeper().setConfiguration(configuration);
     EXPECT_EQ(synchronizationsOfACommit(), 0);
 }
 
-TEST_F(EventWriterTest, ALongPayloadIsKeptWhole)
+TEST_F(SqliteKeeperTest, ALongPayloadIsKeptWhole)
 {
     const std::string text(3'000'000, 'x');
     keep({event(1, "a", {{"text", text}}), event(2, "b")});
@@ -250,7 +250,7 @@ TEST_F(EventWriterTest, ALongPayloadIsKeptWhole)
 
 // --- Files that are not a database, damaged or newer
 
-TEST_F(EventWriterTest, AFileThatIsNoDatabaseIsSetAside)
+TEST_F(SqliteKeeperTest, AFileThatIsNoDatabaseIsSetAside)
 {
     support::writeFile(file(), std::string(5000, 'x'));
     clock.set(1'800'000'000);
@@ -264,7 +264,7 @@ TEST_F(EventWriterTest, AFileThatIsNoDatabaseIsSetAside)
                                                 + aside.string() + ", and a new one is begun")));
 }
 
-TEST_F(EventWriterTest, ADatabaseOfSomethingElseIsSetAside)
+TEST_F(SqliteKeeperTest, ADatabaseOfSomethingElseIsSetAside)
 {
     for (const char* sql :
          {"CREATE TABLE other(a)", "CREATE TABLE events(a); PRAGMA user_version = 1", "PRAGMA user_version = 1",
@@ -282,7 +282,7 @@ TEST_F(EventWriterTest, ADatabaseOfSomethingElseIsSetAside)
     }
 }
 
-TEST_F(EventWriterTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
+TEST_F(SqliteKeeperTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
 {
     keep(events(5000));
     closeWriter();
@@ -296,12 +296,12 @@ TEST_F(EventWriterTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
     }
     keep({event(1, "after")});
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events"), ElementsAre("after"));
-    EXPECT_EQ(writer().keptEvents(), 1U);
+    EXPECT_EQ(keeper().keptEvents(), 1U);
     EXPECT_THAT(filesNamed(".corrupt-"), SizeIs(3)); // with the log and its index
     EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("is damaged or not a database of events"))));
 }
 
-TEST_F(EventWriterTest, OnlySoManyDamagedDatabasesAreKept)
+TEST_F(SqliteKeeperTest, OnlySoManyDamagedDatabasesAreKept)
 {
     for (int number = 0; number < 6; ++number) {
         closeWriter();
@@ -317,7 +317,7 @@ TEST_F(EventWriterTest, OnlySoManyDamagedDatabasesAreKept)
     EXPECT_THAT(contents, ElementsAre("damaged 3", "damaged 4", "damaged 5"));
 }
 
-TEST_F(EventWriterTest, TwoDamagedDatabasesOfOneMomentAreBothKept)
+TEST_F(SqliteKeeperTest, TwoDamagedDatabasesOfOneMomentAreBothKept)
 {
     for (const char* text : {"first", "second"}) {
         closeWriter();
@@ -330,7 +330,7 @@ TEST_F(EventWriterTest, TwoDamagedDatabasesOfOneMomentAreBothKept)
     EXPECT_THAT(contents, testing::IsSupersetOf({"first", "second"}));
 }
 
-TEST_F(EventWriterTest, ANewerDatabaseIsSetAsideUntouched)
+TEST_F(SqliteKeeperTest, ANewerDatabaseIsSetAsideUntouched)
 {
     keep({event(1)});
     closeWriter();
@@ -353,7 +353,7 @@ TEST_F(EventWriterTest, ANewerDatabaseIsSetAsideUntouched)
                 ElementsAre(Field(&LogLine::message, HasSubstr("was made by a later version of the service"))));
 }
 
-TEST_F(EventWriterTest, ADatabaseThatIsTakenAwayIsBegunAnew)
+TEST_F(SqliteKeeperTest, ADatabaseThatIsTakenAwayIsBegunAnew)
 {
     keep({event(1, "a")});
     fs::remove(file());
@@ -362,7 +362,7 @@ TEST_F(EventWriterTest, ADatabaseThatIsTakenAwayIsBegunAnew)
     EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("was removed or replaced"))));
 }
 
-TEST_F(EventWriterTest, ADatabaseThatIsPutInItsPlaceIsGoneOnWith)
+TEST_F(SqliteKeeperTest, ADatabaseThatIsPutInItsPlaceIsGoneOnWith)
 {
     keep({event(1, "a")});
     closeWriter();
@@ -374,10 +374,10 @@ TEST_F(EventWriterTest, ADatabaseThatIsPutInItsPlaceIsGoneOnWith)
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("a", "c"));
 }
 
-TEST_F(EventWriterTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
+TEST_F(SqliteKeeperTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
 {
     keep({event(1, "first")});
-    EventWriter second(directory, clock, ProviderLog(log));
+    SqliteKeeper second(directory, clock, ProviderLog(log));
     second.open();
     EXPECT_THAT(log.take(),
                 ElementsAre(Field(&LogLine::message,
@@ -388,7 +388,7 @@ TEST_F(EventWriterTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
     keepIn(second, given);
     EXPECT_EQ(second.lostEvents(StoreError::InUse), 1U);
     closeWriter();
-    clock.advance(EventWriter::secondsBetweenOpenings);
+    clock.advance(SqliteKeeper::secondsBetweenOpenings);
     keepIn(second, given);
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("first", "second"));
 }
@@ -412,7 +412,7 @@ template <typename Test> void runUnprivileged(const fs::path& owned, Test test)
     EXPECT_EQ(status, 0);
 }
 
-TEST_F(EventWriterTest, AReadOnlyDirectoryLosesEventsAndRecovers)
+TEST_F(SqliteKeeperTest, AReadOnlyDirectoryLosesEventsAndRecovers)
 {
     runUnprivileged(directory, [this] {
         ::chmod(directory.c_str(), 0555);
@@ -424,14 +424,14 @@ TEST_F(EventWriterTest, AReadOnlyDirectoryLosesEventsAndRecovers)
                                             HasSubstr("let the user of the service write")))));
         ::chmod(directory.c_str(), 0755);
         keep({event(3)});
-        EXPECT_EQ(lost(StoreError::CannotOpen), 3U); // the writer does not try to open it again with each event
-        clock.advance(EventWriter::secondsBetweenOpenings);
+        EXPECT_EQ(lost(StoreError::CannotOpen), 3U); // the keeper does not try to open it again with each event
+        clock.advance(SqliteKeeper::secondsBetweenOpenings);
         keep({event(4)});
         EXPECT_EQ(StoreReader(file()).eventCount(), 1);
     });
 }
 
-TEST_F(EventWriterTest, AReadOnlyDatabaseLosesEventsAndRecovers)
+TEST_F(SqliteKeeperTest, AReadOnlyDatabaseLosesEventsAndRecovers)
 {
     runUnprivileged(directory, [this] {
         keep({event(1)});
@@ -441,13 +441,13 @@ TEST_F(EventWriterTest, AReadOnlyDatabaseLosesEventsAndRecovers)
         EXPECT_EQ(lost(StoreError::ReadOnly), 1U);
         EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("the database is read-only"))));
         ::chmod(file().c_str(), 0644);
-        clock.advance(EventWriter::secondsBetweenOpenings);
+        clock.advance(SqliteKeeper::secondsBetweenOpenings);
         keep({event(3)});
         EXPECT_EQ(StoreReader(file()).eventCount(), 2);
     });
 }
 
-TEST_F(EventWriterTest, WithoutWriteAccessAnybodyReadsWhatTheServiceLeft)
+TEST_F(SqliteKeeperTest, WithoutWriteAccessAnybodyReadsWhatTheServiceLeft)
 {
     if (::getuid() != 0)
         GTEST_SKIP() << "only a privileged user can become one without write access";
@@ -471,7 +471,7 @@ TEST_F(EventWriterTest, WithoutWriteAccessAnybodyReadsWhatTheServiceLeft)
     EXPECT_EQ(status, 0);
 }
 
-TEST_F(EventWriterTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
+TEST_F(SqliteKeeperTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
 {
     const fs::path small = directory / "small";
     fs::create_directory(small);
@@ -486,8 +486,8 @@ TEST_F(EventWriterTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
     const std::uint64_t lostEvents = lost(StoreError::DiskFull);
     EXPECT_GT(lostEvents, 0U);
     EXPECT_EQ(lostEvents % 100, 0U); // only whole transactions
-    EXPECT_EQ(writer().keptEvents() + lostEvents, given);
-    EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(writer().keptEvents()));
+    EXPECT_EQ(keeper().keptEvents() + lostEvents, given);
+    EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(keeper().keptEvents()));
     EXPECT_THAT(log.take(),
                 ElementsAre(Field(&LogLine::message,
                                   AllOf(StartsWith("100 analytics events were lost (100 since the start): "),
@@ -503,7 +503,7 @@ TEST_F(EventWriterTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
     ::umount2(small.c_str(), MNT_DETACH);
 }
 
-TEST_F(EventWriterTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
+TEST_F(SqliteKeeperTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
 {
     const pid_t child = ::fork();
     if (child == 0) {
@@ -516,11 +516,11 @@ TEST_F(EventWriterTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
         for (int round = 0; round < 10; ++round)
             keep(events(200));
         EXPECT_GT(lost(StoreError::DiskFull), 0U);
-        EXPECT_EQ(writer().keptEvents() + lost(StoreError::DiskFull), 2010U);
+        EXPECT_EQ(keeper().keptEvents() + lost(StoreError::DiskFull), 2010U);
         ::setrlimit(RLIMIT_FSIZE, &limit);
-        const std::uint64_t before = writer().keptEvents();
+        const std::uint64_t before = keeper().keptEvents();
         keep(events(200));
-        EXPECT_EQ(writer().keptEvents(), before + 200);
+        EXPECT_EQ(keeper().keptEvents(), before + 200);
         EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(before + 200));
         ::_exit(HasFailure() ? 1 : 0);
     }
@@ -529,7 +529,7 @@ TEST_F(EventWriterTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
     EXPECT_EQ(status, 0);
 }
 
-TEST_F(EventWriterTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
+TEST_F(SqliteKeeperTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
 {
     keep({event(1, "a")});
     // SQLite's descriptor of the log becomes one that cannot be written to.
@@ -548,13 +548,13 @@ TEST_F(EventWriterTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("a", "c"));
 }
 
-TEST_F(EventWriterTest, WithoutADatabaseNothingIsLeftToTidy)
+TEST_F(SqliteKeeperTest, WithoutADatabaseNothingIsLeftToTidy)
 {
-    EXPECT_FALSE(writer().tidy(true));
-    EXPECT_FALSE(writer().awaitsQuiet());
+    EXPECT_FALSE(keeper().tidy(true));
+    EXPECT_FALSE(keeper().awaitsQuiet());
 }
 
-TEST_F(EventWriterTest, LossesAreToldAtOnceAndThenOnceAMinute)
+TEST_F(SqliteKeeperTest, LossesAreToldAtOnceAndThenOnceAMinute)
 {
     const Dictionary bad{{"n", std::numeric_limits<double>::quiet_NaN()}};
     const auto lose = [&](std::size_t count) { keep(std::vector<PlainEvent>(count, event(1, "a", bad))); };
@@ -582,7 +582,7 @@ TEST_F(EventWriterTest, LossesAreToldAtOnceAndThenOnceAMinute)
 
 // --- Readers
 
-TEST_F(EventWriterTest, AReaderSeesWhatIsCommittedWhileItGoesOn)
+TEST_F(SqliteKeeperTest, AReaderSeesWhatIsCommittedWhileItGoesOn)
 {
     keep({event(1)});
     StoreReader reader(file());
@@ -592,7 +592,7 @@ TEST_F(EventWriterTest, AReaderSeesWhatIsCommittedWhileItGoesOn)
     }
 }
 
-TEST_F(EventWriterTest, AReaderThatHoldsATransactionSeesOneStateAndHoldsUpNobody)
+TEST_F(SqliteKeeperTest, AReaderThatHoldsATransactionSeesOneStateAndHoldsUpNobody)
 {
     keep({event(1)});
     StoreReader reader(file());
@@ -604,62 +604,62 @@ TEST_F(EventWriterTest, AReaderThatHoldsATransactionSeesOneStateAndHoldsUpNobody
     EXPECT_EQ(reader.eventCount(), 1001);
 }
 
-TEST_F(EventWriterTest, TheLogIsMovedToTheDatabaseBeforeItGrowsLarge)
+TEST_F(SqliteKeeperTest, TheLogIsMovedToTheDatabaseBeforeItGrowsLarge)
 {
-    writer().open();
+    keeper().open();
     StoreReader reader(file()); // connected; it reads only now and then
     for (int round = 0; round < 100; ++round) {
         keep(events(2000));
         maintain();
-        ASSERT_LT(logBytes(), 2 * EventWriter::logBytesBetweenCheckpoints);
+        ASSERT_LT(logBytes(), 2 * SqliteKeeper::logBytesBetweenCheckpoints);
         if (round % 10 == 0)
             reader.eventCount();
     }
     EXPECT_GT(fs::file_size(file()), 50 * megabyte);
 }
 
-TEST_F(EventWriterTest, AMoreThanLongLogIsMovedEvenWhileThereIsMuchToKeep)
+TEST_F(SqliteKeeperTest, AMoreThanLongLogIsMovedEvenWhileThereIsMuchToKeep)
 {
-    writer().open();
+    keeper().open();
     std::uint64_t longest = 0;
     for (int round = 0; round < 100; ++round) {
         keep(events(2000));
         longest = std::max(longest, logBytes());
         maintain(false);
     }
-    EXPECT_GT(longest, EventWriter::mostLogBytesBetweenCheckpoints);
-    EXPECT_LT(longest, EventWriter::mostLogBytesBetweenCheckpoints + 2 * megabyte);
+    EXPECT_GT(longest, SqliteKeeper::mostLogBytesBetweenCheckpoints);
+    EXPECT_LT(longest, SqliteKeeper::mostLogBytesBetweenCheckpoints + 2 * megabyte);
     EXPECT_GT(fs::file_size(file()), 20 * megabyte);
 }
 
-TEST_F(EventWriterTest, ALongLogIsMovedOnlyInAQuietMoment)
+TEST_F(SqliteKeeperTest, ALongLogIsMovedOnlyInAQuietMoment)
 {
-    writer().open();
-    EXPECT_FALSE(writer().awaitsQuiet());
+    keeper().open();
+    EXPECT_FALSE(keeper().awaitsQuiet());
     for (int round = 0; round < 15; ++round)
         keep(events(2000));
     maintain(false);
     EXPECT_LT(fs::file_size(file()), megabyte);
-    EXPECT_TRUE(writer().awaitsQuiet());
+    EXPECT_TRUE(keeper().awaitsQuiet());
     maintain(true);
     EXPECT_GT(fs::file_size(file()), 8 * megabyte);
-    EXPECT_FALSE(writer().awaitsQuiet());
+    EXPECT_FALSE(keeper().awaitsQuiet());
 }
 
-TEST_F(EventWriterTest, ALogThatAReaderHoldsIsNotWaitedForAgainAndAgain)
+TEST_F(SqliteKeeperTest, ALogThatAReaderHoldsIsNotWaitedForAgainAndAgain)
 {
-    writer().open();
+    keeper().open();
     StoreReader reader(file());
     reader.execute("BEGIN");
     EXPECT_EQ(reader.eventCount(), 0);
     for (int round = 0; round < 15; ++round)
         keep(events(2000));
-    EXPECT_TRUE(writer().awaitsQuiet());
+    EXPECT_TRUE(keeper().awaitsQuiet());
     maintain(true);
-    EXPECT_FALSE(writer().awaitsQuiet());
+    EXPECT_FALSE(keeper().awaitsQuiet());
 }
 
-TEST_F(EventWriterTest, AReaderThatNeverEndsCostsEventsButNotTheDisk)
+TEST_F(SqliteKeeperTest, AReaderThatNeverEndsCostsEventsButNotTheDisk)
 {
     configuration.maximumSizeMegabytes = 12;
     keep(events(100));
@@ -685,7 +685,7 @@ TEST_F(EventWriterTest, AReaderThatNeverEndsCostsEventsButNotTheDisk)
     EXPECT_EQ(lost(StoreError::LogHeld), before);
 }
 
-TEST_F(EventWriterTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginningAnew)
+TEST_F(SqliteKeeperTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginningAnew)
 {
     configuration.maximumSizeMegabytes = 4;
     keep(events(100));
@@ -708,13 +708,13 @@ TEST_F(EventWriterTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginning
     for (int round = 0; round < 60; ++round) {
         keep(events(500));
         maintain();
-        clock.advance(EventWriter::secondsBetweenWaits); // on a busy machine a wait may fail; it is repeated
+        clock.advance(SqliteKeeper::secondsBetweenWaits); // on a busy machine a wait may fail; it is repeated
     }
     EXPECT_EQ(lost(StoreError::LogHeld), 0U);
     EXPECT_LT(logBytes(), 5 * megabyte);
 }
 
-TEST_F(EventWriterTest, AProgramThatWritesHoldsUpTheStoreButNotForEver)
+TEST_F(SqliteKeeperTest, AProgramThatWritesHoldsUpTheStoreButNotForEver)
 {
     keep({event(1)});
     sqlite3* other = nullptr;
@@ -731,7 +731,7 @@ TEST_F(EventWriterTest, AProgramThatWritesHoldsUpTheStoreButNotForEver)
 
 // --- Bounds
 
-TEST_F(EventWriterTest, WhatIsTooOldGoes)
+TEST_F(SqliteKeeperTest, WhatIsTooOldGoes)
 {
     configuration.maximumAgeDays = 10;
     clock.set(100 * 86400);
@@ -744,7 +744,7 @@ TEST_F(EventWriterTest, WhatIsTooOldGoes)
     EXPECT_EQ(StoreReader(file()).eventCount(), 35);
 }
 
-TEST_F(EventWriterTest, AgeIsLookedAtRarely)
+TEST_F(SqliteKeeperTest, AgeIsLookedAtRarely)
 {
     configuration.maximumAgeDays = 10;
     clock.set(100 * 86400);
@@ -754,21 +754,21 @@ TEST_F(EventWriterTest, AgeIsLookedAtRarely)
     keep({event(200 * 86400)});
     maintain();
     EXPECT_EQ(StoreReader(file()).eventCount(), 2);
-    clock.advance(EventWriter::secondsBetweenChecks);
+    clock.advance(SqliteKeeper::secondsBetweenChecks);
     maintain();
     EXPECT_EQ(StoreReader(file()).eventCount(), 1);
 }
 
-TEST_F(EventWriterTest, AClockThatIsNotSetYetDeletesNothing)
+TEST_F(SqliteKeeperTest, AClockThatIsNotSetYetDeletesNothing)
 {
     keep(events(100));
     clock.set(0);
-    clock.advance(EventWriter::secondsBetweenChecks);
+    clock.advance(SqliteKeeper::secondsBetweenChecks);
     maintain();
     EXPECT_EQ(StoreReader(file()).eventCount(), 100);
 }
 
-TEST_F(EventWriterTest, WhatIsTooMuchGoesOldestFirst)
+TEST_F(SqliteKeeperTest, WhatIsTooMuchGoesOldestFirst)
 {
     configuration.maximumSizeMegabytes = 2;
     for (int round = 0; round < 30; ++round) {
@@ -777,14 +777,14 @@ TEST_F(EventWriterTest, WhatIsTooMuchGoesOldestFirst)
     }
     closeWriter();
     StoreReader reader(file());
-    EXPECT_LT(fs::file_size(file()), 2 * megabyte + 2 * EventWriter::bytesBetweenChecks);
+    EXPECT_LT(fs::file_size(file()), 2 * megabyte + 2 * SqliteKeeper::bytesBetweenChecks);
     EXPECT_EQ(reader.number("SELECT max(id) FROM events"), 30'000);
     EXPECT_EQ(reader.number("SELECT max(id) - min(id) + 1 - count(*) FROM events"), 0); // no gap: the oldest went first
     EXPECT_GT(reader.eventCount(), 3000);
     EXPECT_EQ(reader.text("PRAGMA integrity_check"), "ok");
 }
 
-TEST_F(EventWriterTest, FewButLargeEventsDoNotSlipThroughTheBound)
+TEST_F(SqliteKeeperTest, FewButLargeEventsDoNotSlipThroughTheBound)
 {
     configuration.maximumSizeMegabytes = 4;
     keep(events(10'000, 50));
@@ -796,26 +796,26 @@ TEST_F(EventWriterTest, FewButLargeEventsDoNotSlipThroughTheBound)
     EXPECT_GE(StoreReader(file()).eventCount(), 3);
 }
 
-TEST_F(EventWriterTest, ALowerBoundMakesTheFileSmaller)
+TEST_F(SqliteKeeperTest, ALowerBoundMakesTheFileSmaller)
 {
     keep(events(30'000));
     maintain();
     configuration.maximumSizeMegabytes = 1;
-    writer().setConfiguration(configuration);
+    keeper().setConfiguration(configuration);
     maintain();
     closeWriter();
     EXPECT_LT(fs::file_size(file()), 2 * megabyte);
     EXPECT_GT(StoreReader(file()).eventCount(), 1000);
 }
 
-TEST_F(EventWriterTest, HousekeepingIsDoneInSmallSteps)
+TEST_F(SqliteKeeperTest, HousekeepingIsDoneInSmallSteps)
 {
     keep(events(30'000));
     maintain();
     configuration.maximumSizeMegabytes = 1;
-    writer().setConfiguration(configuration);
+    keeper().setConfiguration(configuration);
     int steps = 1;
-    while (writer().tidy(true))
+    while (keeper().tidy(true))
         ++steps;
     EXPECT_GT(steps, 15);
 }
