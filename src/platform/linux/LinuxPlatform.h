@@ -11,7 +11,7 @@
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/bugs/LinuxBugCapture.h"
 #include "platform/linux/channels/LinuxReportingChannels.h"
-#include "platform/linux/diagnostics/FolderKeeper.h"
+#include "platform/linux/diagnostics/FolderLimits.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "platform/linux/log/LinuxLog.h"
 #include "platform/linux/process/LinuxClock.h"
@@ -53,7 +53,7 @@ private:
     LinuxFeatureFlags featureFlags_;
     LinuxDeviceProperties deviceProperties_;
     LinuxProcessTable processTable_;
-    FolderKeeper folderKeeper_;
+    FolderLimits folderLimits_;
     LinuxFileSystem fileSystem_;
     TracefsEmitter traceEmitter_;
     EmitterAccess emitterAccess_;

@@ -1,7 +1,7 @@
 // The contract of platform/FileSystem.h: folders with their permissions, files that are complete or missing, and the
 // errors of files that cannot be written or read.
 #include "platform/contract/Contract.h"
-#include "platform/linux/diagnostics/FolderKeeper.h"
+#include "platform/linux/diagnostics/FolderLimits.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeClock.h"
@@ -102,8 +102,8 @@ private:
     support::FakeLog log_;
     support::FakeClock clock_;
     support::FakeWorkQueues queues_{clock_};
-    platform::FolderKeeper keeper_{queues_, platform::ProviderLog(log_)};
-    platform::LinuxFileSystem files_{root_.path(), &keeper_};
+    platform::FolderLimits limits_{queues_, platform::ProviderLog(log_)};
+    platform::LinuxFileSystem files_{root_.path(), &limits_};
 };
 
 bool isNote(std::string_view name)

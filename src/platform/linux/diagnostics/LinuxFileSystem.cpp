@@ -2,7 +2,7 @@
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 
 #include "foundation/text/Format.h"
-#include "platform/linux/diagnostics/FolderKeeper.h"
+#include "platform/linux/diagnostics/FolderLimits.h"
 #include "platform/linux/files/FilesAt.h"
 #include "platform/linux/files/SmallFile.h"
 #include "platform/linux/files/SystemError.h"
@@ -85,10 +85,10 @@ std::optional<unsigned> permissionsOf(const std::filesystem::path& folder)
 
 } // namespace
 
-LinuxFileSystem::LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderKeeper* keeper)
+LinuxFileSystem::LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderLimits* limits)
     : diagnosticLogRoot_(std::move(diagnosticLogRoot)),
       rootPermissions_(permissionsOf(diagnosticLogRoot_)),
-      keeper_(keeper)
+      limits_(limits)
 {
 }
 
@@ -158,15 +158,15 @@ LinuxFileSystem::createAtomically(const std::filesystem::path& path)
 
 void LinuxFileSystem::keepWithin(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes)
 {
-    if (keeper_ != nullptr)
-        keeper_->added(folder, kept, bytes, [this, folder] { return openDirectory(folder); });
+    if (limits_ != nullptr)
+        limits_->added(folder, kept, bytes, [this, folder] { return openDirectory(folder); });
 }
 
 void LinuxFileSystem::removeUnfinished(const std::filesystem::path& folder)
 {
     const auto opened = openDirectory(folder);
-    if (opened && keeper_ != nullptr)
-        keeper_->removeUnfinished(folder, opened->get());
+    if (opened && limits_ != nullptr)
+        limits_->removeUnfinished(folder, opened->get());
 }
 
 std::expected<std::string, std::error_code> LinuxFileSystem::readFile(const std::filesystem::path& path,

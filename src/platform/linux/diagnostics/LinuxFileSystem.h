@@ -22,13 +22,13 @@
 
 namespace platform {
 
-class FolderKeeper;
+class FolderLimits;
 
 // Any thread. It outlives the background queue's work.
 class LinuxFileSystem final : public FileSystem {
 public:
-    // The keeper must outlive it. Without a keeper folders have no limits.
-    explicit LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderKeeper* keeper = nullptr);
+    // The limits must outlive it. Null: folders have no limits.
+    explicit LinuxFileSystem(std::filesystem::path diagnosticLogRoot, FolderLimits* limits = nullptr);
 
     [[nodiscard]] std::filesystem::path diagnosticLogRoot() const override { return diagnosticLogRoot_; }
     [[nodiscard]] std::expected<void, std::error_code> createDirectories(const std::filesystem::path& path,
@@ -58,7 +58,7 @@ private:
 
     const std::filesystem::path diagnosticLogRoot_;
     const std::optional<unsigned> rootPermissions_; // at the start; nothing if the root did not exist
-    FolderKeeper* const keeper_;
+    FolderLimits* const limits_;
 };
 
 } // namespace platform

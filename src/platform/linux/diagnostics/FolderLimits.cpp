@@ -1,6 +1,6 @@
 // The age of a file is the time of its last write. Its name holds the wall-clock time, which the device's owner may set
 // back.
-#include "platform/linux/diagnostics/FolderKeeper.h"
+#include "platform/linux/diagnostics/FolderLimits.h"
 
 #include "platform/linux/files/FilesAt.h"
 #include "platform/linux/files/Surplus.h"
@@ -35,13 +35,13 @@ std::size_t howManyGo(std::span<const std::uint64_t> sizes, const KeptFiles& kep
 
 } // namespace
 
-struct FolderKeeper::File {
+struct FolderLimits::File {
     std::pair<std::int64_t, std::int64_t> age; // seconds and nanoseconds since 1970
     std::string name;
     std::uint64_t bytes;
 };
 
-void FolderKeeper::added(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes, Open open)
+void FolderLimits::added(const std::filesystem::path& folder, const KeptFiles& kept, std::uint64_t bytes, Open open)
 {
     {
         const foundation::Lock lock(lock_);
@@ -57,7 +57,7 @@ void FolderKeeper::added(const std::filesystem::path& folder, const KeptFiles& k
 }
 
 // Files that cannot be removed count as removed, to avoid another attempt with each new file.
-void FolderKeeper::look(const std::filesystem::path& folder, const KeptFiles& kept, const Open& open)
+void FolderLimits::look(const std::filesystem::path& folder, const KeptFiles& kept, const Open& open)
 {
     const auto opened = open();
     const auto files = opened ? filesIn(opened->get(), kept.isOne) : std::unexpected(opened.error());
@@ -79,7 +79,7 @@ void FolderKeeper::look(const std::filesystem::path& folder, const KeptFiles& ke
     account.isLookedThrough = false;
 }
 
-void FolderKeeper::removeUnfinished(const std::filesystem::path& folder, int opened)
+void FolderLimits::removeUnfinished(const std::filesystem::path& folder, int opened)
 {
     const auto files = filesIn(opened, isTemporaryName);
     const Removal removal = files ? remove(*files, opened) : Removal{.reason = files.error()};
@@ -91,8 +91,8 @@ void FolderKeeper::removeUnfinished(const std::filesystem::path& folder, int ope
 }
 
 // The files of that kind, the oldest first, with the unfinished files of a killed service.
-std::expected<std::vector<FolderKeeper::File>, std::error_code>
-FolderKeeper::filesIn(int folder, bool (*isOne)(std::string_view name))
+std::expected<std::vector<FolderLimits::File>, std::error_code>
+FolderLimits::filesIn(int folder, bool (*isOne)(std::string_view name))
 {
     auto names = namesIn(folder, mostNames);
     if (!names)
@@ -112,7 +112,7 @@ FolderKeeper::filesIn(int folder, bool (*isOne)(std::string_view name))
     return files;
 }
 
-FolderKeeper::Removal FolderKeeper::remove(std::span<const File> files, int folder)
+FolderLimits::Removal FolderLimits::remove(std::span<const File> files, int folder)
 {
     Removal removal;
     for (const File& file : files) {
@@ -126,7 +126,7 @@ FolderKeeper::Removal FolderKeeper::remove(std::span<const File> files, int fold
     return removal;
 }
 
-void FolderKeeper::removeOldest(std::span<const File> files, int folder, const std::filesystem::path& path,
+void FolderLimits::removeOldest(std::span<const File> files, int folder, const std::filesystem::path& path,
                                 const KeptFiles& kept)
 {
     const Removal removal = remove(files, folder);

@@ -4,8 +4,8 @@
 // waits, and the folder is read in the background when the sum passes a limit. Then it is cleared down to three
 // quarters, so that the next look comes a thousand files later and not with the next file.
 //
-// Other users may have files there as well, or make files that look like the service's. So the keeper removes only
-// regular files of the service's user with the right form of name, and removes them by their name in the open folder.
+// Other users may have files there as well, or make files that look like the service's. So it removes only regular
+// files of the service's user with the right form of name, and removes them by their name in the open folder.
 #pragma once
 
 #include "foundation/Mutex.h"
@@ -22,11 +22,11 @@
 namespace platform {
 
 // Any thread. It outlives the background queue's work.
-class FolderKeeper {
+class FolderLimits {
 public:
     using Open = std::function<std::expected<FileDescriptor, std::error_code>()>;
 
-    FolderKeeper(WorkQueues& workQueues, ProviderLog log) : workQueues_(workQueues), log_(log) { }
+    FolderLimits(WorkQueues& workQueues, ProviderLog log) : workQueues_(workQueues), log_(log) { }
 
     // A file of so many bytes was added to the folder. If a look is due, `open` is called on the background queue to
     // open the folder. A look that removes files logs one line.

@@ -1,5 +1,5 @@
-// A folder that fills up: which files are removed, which stay, and how rarely the keeper reads it.
-#include "platform/linux/diagnostics/FolderKeeper.h"
+// A folder that fills up: which files are removed, which stay, and how rarely it is read.
+#include "platform/linux/diagnostics/FolderLimits.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeClock.h"
@@ -28,9 +28,9 @@ bool isNote(std::string_view name)
     return name.starts_with("note-");
 }
 
-class FolderKeeperTest : public testing::Test {
+class FolderLimitsTest : public testing::Test {
 protected:
-    FolderKeeperTest() { fs::create_directories(folder); }
+    FolderLimitsTest() { fs::create_directories(folder); }
 
     // A file of that age: the higher the number, the younger it is.
     void make(const std::string& name, int number, std::size_t size = 1) const
@@ -38,7 +38,7 @@ protected:
         support::writeFile(folder / name, std::string(size, 'x'));
         fs::last_write_time(folder / name, epoch + std::chrono::hours(number));
     }
-    // The same, reported to the keeper.
+    // The same, reported to the limits.
     void add(int number, std::size_t size = 1)
     {
         make("note-" + std::to_string(number), number, size);
@@ -81,11 +81,11 @@ protected:
     support::FakeClock clock;
     support::FakeWorkQueues queues{clock};
     support::FakeLog log;
-    platform::FolderKeeper keeper{queues, platform::ProviderLog(log)};
-    platform::LinuxFileSystem files{root.path(), &keeper};
+    platform::FolderLimits limits{queues, platform::ProviderLog(log)};
+    platform::LinuxFileSystem files{root.path(), &limits};
 };
 
-TEST_F(FolderKeeperTest, LetsTheOldestGoWhenThereAreTooManyAndLeavesRoomForMore)
+TEST_F(FolderLimitsTest, LetsTheOldestGoWhenThereAreTooManyAndLeavesRoomForMore)
 {
     for (int number = 8; number >= 1; --number)
         add(number);
@@ -95,14 +95,14 @@ TEST_F(FolderKeeperTest, LetsTheOldestGoWhenThereAreTooManyAndLeavesRoomForMore)
     add(9);
     queues.runAll();
     EXPECT_THAT(names(), ElementsAre("note-4", "note-5", "note-6", "note-7", "note-8", "note-9"));
-    EXPECT_EQ(keeper.removedFiles(), 3U);
+    EXPECT_EQ(limits.removedFiles(), 3U);
     EXPECT_THAT(log.lines(),
                 ElementsAre(IsLine(Default, "kerl",
                                    "removed the oldest 3 files from " + folder.string()
                                        + ", 3 since the start: there may be 8 of 0 MiB together")));
 }
 
-TEST_F(FolderKeeperTest, LetsTheOldestGoWhenTheyAreTooLargeTogether)
+TEST_F(FolderLimitsTest, LetsTheOldestGoWhenTheyAreTooLargeTogether)
 {
     for (int number = 1; number <= 3; ++number)
         add(number, 300);
@@ -113,7 +113,7 @@ TEST_F(FolderKeeperTest, LetsTheOldestGoWhenTheyAreTooLargeTogether)
     EXPECT_THAT(names(), ElementsAre("note-2", "note-3", "note-4"));
 }
 
-TEST_F(FolderKeeperTest, AlwaysLeavesTheNewest)
+TEST_F(FolderLimitsTest, AlwaysLeavesTheNewest)
 {
     add(1);
     queues.runAll();
@@ -125,7 +125,7 @@ TEST_F(FolderKeeperTest, AlwaysLeavesTheNewest)
     EXPECT_THAT(names(), ElementsAre("note-3"));
 }
 
-TEST_F(FolderKeeperTest, CountsWhatWasThereBeforeTheService)
+TEST_F(FolderLimitsTest, CountsWhatWasThereBeforeTheService)
 {
     for (int number = 100; number < 200; ++number)
         make("note-" + std::to_string(number), number);
@@ -134,7 +134,7 @@ TEST_F(FolderKeeperTest, CountsWhatWasThereBeforeTheService)
     EXPECT_THAT(names(), ElementsAre("note-195", "note-196", "note-197", "note-198", "note-199", "note-200"));
 }
 
-TEST_F(FolderKeeperTest, LooksAtTheFirstFileAndThenOnlyWhenTheSumPassesALimit)
+TEST_F(FolderLimitsTest, LooksAtTheFirstFileAndThenOnlyWhenTheSumPassesALimit)
 {
     std::size_t looks = 0;
     constexpr int rounds = 10;
@@ -147,7 +147,7 @@ TEST_F(FolderKeeperTest, LooksAtTheFirstFileAndThenOnlyWhenTheSumPassesALimit)
     EXPECT_EQ(looks, 2U + rounds) << "one a quarter of the limit";
 }
 
-TEST_F(FolderKeeperTest, LooksOnceHoweverManyFilesComeMeanwhileAndForgetsNone)
+TEST_F(FolderLimitsTest, LooksOnceHoweverManyFilesComeMeanwhileAndForgetsNone)
 {
     for (int number = 1; number <= 20; ++number)
         add(number);
@@ -161,7 +161,7 @@ TEST_F(FolderKeeperTest, LooksOnceHoweverManyFilesComeMeanwhileAndForgetsNone)
     }
 }
 
-TEST_F(FolderKeeperTest, RemovesNothingButFilesOfThatShape)
+TEST_F(FolderLimitsTest, RemovesNothingButFilesOfThatShape)
 {
     make("other", 0, 5000);
     make("a-note-1", 0, 5000);
@@ -176,10 +176,10 @@ TEST_F(FolderKeeperTest, RemovesNothingButFilesOfThatShape)
     queues.runAll();
     EXPECT_THAT(names(), IsSupersetOf(before));
     EXPECT_THAT(names(), SizeIs(before.size() + 6));
-    EXPECT_EQ(keeper.removedFiles(), 3U);
+    EXPECT_EQ(limits.removedFiles(), 3U);
 }
 
-TEST_F(FolderKeeperTest, RemovesNoFilesOfOtherUsers)
+TEST_F(FolderLimitsTest, RemovesNoFilesOfOtherUsers)
 {
     constexpr uid_t nobody = 65534;
     make("note-of-another", 0);
@@ -189,10 +189,10 @@ TEST_F(FolderKeeperTest, RemovesNoFilesOfOtherUsers)
         add(number);
     queues.runAll();
     EXPECT_THAT(names(), testing::Contains("note-of-another"));
-    EXPECT_EQ(keeper.removedFiles(), 3U);
+    EXPECT_EQ(limits.removedFiles(), 3U);
 }
 
-TEST_F(FolderKeeperTest, RemovesWhatAKilledServiceHadBegunToWrite)
+TEST_F(FolderLimitsTest, RemovesWhatAKilledServiceHadBegunToWrite)
 {
     {
         auto begun = files.createAtomically(folder / "note-0");
@@ -209,7 +209,7 @@ TEST_F(FolderKeeperTest, RemovesWhatAKilledServiceHadBegunToWrite)
     EXPECT_THAT(names(), ElementsAre("note-3", "note-4", "note-5", "note-6", "note-7", "note-8"));
 }
 
-TEST_F(FolderKeeperTest, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingElse)
+TEST_F(FolderLimitsTest, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingElse)
 {
     make(".kestod-0123456789abcdef.tmp", 0, 5000);
     make(".kestod-fedcba9876543210.tmp", 1);
@@ -227,7 +227,7 @@ TEST_F(FolderKeeperTest, RemovesAllThatAKilledServiceHadBegunToWriteAndNothingEl
                            "removed 2 files from " + folder.string() + " that a killed service had not finished")));
 }
 
-TEST_F(FolderKeeperTest, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissing)
+TEST_F(FolderLimitsTest, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissing)
 {
     make("note-1", 0);
     files.removeUnfinished(folder);
@@ -236,7 +236,7 @@ TEST_F(FolderKeeperTest, SaysNothingOfAFolderWithoutUnfinishedFilesOrThatIsMissi
     EXPECT_THAT(log.lines(), IsEmpty());
 }
 
-TEST_F(FolderKeeperTest, DoesNotLookThroughALink)
+TEST_F(FolderLimitsTest, DoesNotLookThroughALink)
 {
     for (int number = 1; number <= 8; ++number)
         add(number);
@@ -253,7 +253,7 @@ TEST_F(FolderKeeperTest, DoesNotLookThroughALink)
     EXPECT_EQ(queues.pending(), 0U) << "not with each new file";
 }
 
-TEST_F(FolderKeeperTest, SaysOnceWhatItCannotRemove)
+TEST_F(FolderLimitsTest, SaysOnceWhatItCannotRemove)
 {
     for (int number = 1; number <= 8; ++number)
         add(number);
@@ -270,7 +270,7 @@ TEST_F(FolderKeeperTest, SaysOnceWhatItCannotRemove)
     EXPECT_THAT(names(), SizeIs(11));
 }
 
-TEST_F(FolderKeeperTest, SaysThatItCannotRemoveWhatAKilledServiceHadBegunToWrite)
+TEST_F(FolderLimitsTest, SaysThatItCannotRemoveWhatAKilledServiceHadBegunToWrite)
 {
     make(".kestod-0123456789abcdef.tmp", 0);
     EXPECT_TRUE(isTrueWithoutRightToRemove([&] {
