@@ -3,8 +3,8 @@
 // bytes.
 #include "Groups.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/trace/EmittedEvent.h"
 #include "platform/linux/trace/EmitterAccess.h"
-#include "platform/linux/trace/EmitterInterface.h"
 #include "platform/linux/trace/TraceMerger.h"
 #include "platform/linux/trace/TracefsEmitter.h"
 #include "platform/linux/trace/TracefsInstance.h"

@@ -1,7 +1,7 @@
 // All steps that can fail come before the exchange, which is one system call.
 #include "AttachableEmitter.h"
 
-#include "platform/linux/trace/EmitterInterface.h"
+#include "platform/linux/trace/EmittedEvent.h"
 
 #include <cerrno>
 #include <fcntl.h>

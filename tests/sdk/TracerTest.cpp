@@ -1,8 +1,8 @@
 // Emitting trace events while a client connects, gets the marker, and loses its connection again. The marker is a pipe,
 // the page the service's own.
 #include "kesto/trace.hpp"
+#include "platform/linux/trace/EmittedEvent.h"
 #include "platform/linux/trace/EmitterAccess.h"
-#include "platform/linux/trace/EmitterInterface.h"
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
 #include "sdk/Recorder.h"

@@ -2,7 +2,7 @@
 // trace.
 #include "platform/contract/Contract.h"
 #include "platform/linux/files/FileDescriptor.h"
-#include "platform/linux/trace/EmitterInterface.h"
+#include "platform/linux/trace/EmittedEvent.h"
 #include "platform/linux/trace/TracefsEmitter.h"
 #include "support/fakes/FakeTraceEmitter.h"
 

@@ -3,7 +3,7 @@
 // when it gets the event.
 #pragma once
 
-#include "platform/linux/trace/EmitterInterface.h"
+#include "platform/linux/trace/EmittedEvent.h"
 
 namespace platform {
 

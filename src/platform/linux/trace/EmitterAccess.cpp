@@ -3,7 +3,7 @@
 #include "platform/linux/trace/EmitterAccess.h"
 
 #include "platform/linux/files/SystemError.h"
-#include "platform/linux/trace/EmitterInterface.h"
+#include "platform/linux/trace/EmittedEvent.h"
 
 #include <atomic>
 #include <cassert>

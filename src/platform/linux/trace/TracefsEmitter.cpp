@@ -1,7 +1,7 @@
 // One write. If it fails, the event is lost.
 #include "platform/linux/trace/TracefsEmitter.h"
 
-#include "platform/linux/trace/EmitterInterface.h"
+#include "platform/linux/trace/EmittedEvent.h"
 
 #include <unistd.h>
 

@@ -1,7 +1,7 @@
 // The descriptors with which clients emit trace events: when clients get them, which clients do, and their limits.
 #include "platform/linux/trace/EmitterAccess.h"
 #include "platform/linux/connection/ConnectionHarness.h"
-#include "platform/linux/trace/EmitterInterface.h"
+#include "platform/linux/trace/EmittedEvent.h"
 
 #include <fcntl.h>
 #include <gmock/gmock.h>

@@ -2,7 +2,7 @@
 #pragma once
 
 #include "platform/linux/files/FileDescriptor.h"
-#include "platform/linux/trace/EmitterInterface.h"
+#include "platform/linux/trace/EmittedEvent.h"
 #include "support/TemporaryDirectory.h"
 
 #include <array>
