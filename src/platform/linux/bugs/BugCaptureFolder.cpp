@@ -74,7 +74,7 @@ std::error_code syncDirectory(int directory)
     return ::fsync(directory) == 0 ? std::error_code() : systemError();
 }
 
-std::error_code writeAll(int directory, const std::vector<BugCaptureFolder::File>& files)
+std::error_code writeFiles(int directory, const std::vector<BugCaptureFolder::File>& files)
 {
     for (const auto& [name, text] : files)
         if (const auto error = writeFileAt(directory, name, text))
@@ -237,10 +237,10 @@ std::error_code BugCaptureFolder::write(int folder, const std::string& hidden, c
         const auto bulk = makeDirectoryAt(made->get(), stateName);
         if (!bulk)
             return bulk.error();
-        if (const auto error = writeAll(bulk->get(), state))
+        if (const auto error = writeFiles(bulk->get(), state))
             return error;
     }
-    return writeAll(made->get(), files);
+    return writeFiles(made->get(), files);
 }
 
 std::error_code BugCaptureFolder::add(const std::string& name, const std::vector<File>& files,

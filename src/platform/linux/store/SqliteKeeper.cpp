@@ -160,7 +160,7 @@ void SqliteKeeper::keep(EventBatch& events)
 
 SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows)
 {
-    const auto writeAll = [&]() -> Expected<> {
+    const auto insertAll = [&]() -> Expected<> {
         if (const auto done = ensureOpen(); !done)
             return done;
         if (database_->logBytes() > maximumBytes() && !emptyLog())
@@ -171,7 +171,7 @@ SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows)
             return done;
         return database_->commit();
     };
-    const auto done = writeAll();
+    const auto done = insertAll();
     if (!done) {
         handleFailure(done.error());
         return done;
