@@ -22,7 +22,7 @@ constexpr std::uint64_t unansweredCall(std::size_t bytes) noexcept
 }
 
 // The one request beside the calls of the service's operations.
-bool asksForTraceMarker(const foundation::Array& frame)
+bool asksForEmitterAccess(const foundation::Array& frame)
 {
     if (frame.size() != 2)
         return false;
@@ -161,8 +161,8 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
         if (!*frame)
             return {};
         auto& [array, size] = **frame;
-        if (asksForTraceMarker(array)) {
-            if (auto asked = askForTraceMarker(array[0]); !asked)
+        if (asksForEmitterAccess(array)) {
+            if (auto asked = askForEmitterAccess(array[0]); !asked)
                 return asked;
             continue;
         }
@@ -187,12 +187,12 @@ std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
 
 // This request is not a call of the service: it concerns only the connection, and no other part of the service sees it.
 // Each connection may ask once, so that no client can make the service keep many requests or descriptors.
-std::expected<void, Connection::Violation> LinuxConnection::askForTraceMarker(const foundation::Value& call)
+std::expected<void, Connection::Violation> LinuxConnection::askForEmitterAccess(const foundation::Value& call)
 {
     const auto number = call.exactly<std::uint64_t>();
     if (!number)
         return std::unexpected(Violation{"a call's number is an unsigned 64-bit integer"});
-    if (std::exchange(hasAskedForTraceMarker_, true))
+    if (std::exchange(hasAskedForEmitterAccess_, true))
         return std::unexpected(Violation{"it asks for the trace marker twice"});
     if (hub_->emitterAccess != nullptr)
         hub_->emitterAccess->ask(this,
@@ -330,7 +330,7 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
             ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_DEL, socket_.get(), nullptr);
         socket_ = FileDescriptor();
     }
-    if (hasAskedForTraceMarker_ && hub_->emitterAccess != nullptr)
+    if (hasAskedForEmitterAccess_ && hub_->emitterAccess != nullptr)
         hub_->emitterAccess->forget(this);
     if (readingPauses != 0 || droppedBytes_ != 0)
         KESTO_LOG(hub_->log, Default, "{} was behind: reading paused {} times, {} bytes of answers were dropped",

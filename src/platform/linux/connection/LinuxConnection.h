@@ -72,7 +72,7 @@ private:
     void takeIn(std::string_view bytes);
     [[nodiscard]] std::expected<void, Violation> decodeFrames();
     [[nodiscard]] std::expected<void, Violation> deliverCalls();
-    [[nodiscard]] std::expected<void, Violation> askForTraceMarker(const foundation::Value& call);
+    [[nodiscard]] std::expected<void, Violation> askForEmitterAccess(const foundation::Value& call);
     void handOver(std::uint64_t call, const EmitterDescriptors& descriptors);
     void breakOff(std::string reason);
     void end(std::optional<std::string> interruptedBecause);
@@ -92,7 +92,7 @@ private:
     EndHandler invalidationHandler_;
     ConnectionInput input_;
     bool peerIsDone_ = false; // it closed its side between two frames
-    bool hasAskedForTraceMarker_ = false;
+    bool hasAskedForEmitterAccess_ = false;
 
     // How far the client is behind.
     std::atomic<std::uint64_t> unanswered_; // calls in the upper half, their bytes in the lower half
