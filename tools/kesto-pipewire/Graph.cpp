@@ -72,14 +72,14 @@ void Graph::addLink(ObjectID link, ObjectID outputNode, ObjectID inputNode, Mome
         return;
     links_[link] = {outputNode, inputNode};
     for (const auto node : {outputNode, inputNode})
-        tellLinks(node, when);
+        reportLinks(node, when);
 }
 
 void Graph::remove(ObjectID object, Moment when)
 {
     if (const auto link = links_.extract(object))
         for (const auto node : {link.mapped().outputNode, link.mapped().inputNode})
-            tellLinks(node, when);
+            reportLinks(node, when);
     removeNode(object, when);
     clients_.erase(object);
 }
@@ -108,7 +108,7 @@ void Graph::removeNode(ObjectID id, Moment when)
         return link.touches(id);
     });
     for (const auto partner : partners)
-        tellLinks(partner, when);
+        reportLinks(partner, when);
 }
 
 void Graph::endStreams(Moment when)
@@ -144,7 +144,7 @@ void Graph::describeNode(ObjectID id, const Identity& identity, std::string_view
     auto& node = found->second;
     node.hasAppeared = true;
     listener_.appeared(node.serial, {*node.direction, std::string(role), applicationOf(node, identity)}, when);
-    tellDevices(id, when);
+    reportDevices(id, when);
 }
 
 std::string Graph::applicationOf(const Node& node, const Identity& own) const
@@ -210,11 +210,11 @@ void Graph::noteCycle(const Cycle& cycle)
         anyIsLate = anyIsLate || part.isLate;
         if (const auto* stream = part.isLate ? appearedStream(part.node) : nullptr)
             listener_.cycleWasLate(stream->serial, began);
-        tellCycle(part);
+        reportCycle(part);
     }
     if (auto driver = cycle.driver) {
         driver->isLate = anyIsLate;
-        tellCycle(*driver);
+        reportCycle(*driver);
     }
 }
 
@@ -228,7 +228,7 @@ bool Graph::isSettingOff(ObjectID id, Moment when) const
     return !setOffAt || when.uptime < setOffAt->uptime + startUpTime;
 }
 
-void Graph::tellCycle(const NodeCycle& cycle)
+void Graph::reportCycle(const NodeCycle& cycle)
 {
     if (const auto found = nodes_.find(cycle.node); found != nodes_.end() && found->second.isDevice)
         deviceListener_.deviceCycle(found->second.serial, cycle);
@@ -248,13 +248,13 @@ std::string Graph::devicesOf(ObjectID id) const
     return tidyText(devices, maximumDevicesBytes);
 }
 
-void Graph::tellLinks(ObjectID id, Moment when)
+void Graph::reportLinks(ObjectID id, Moment when)
 {
-    tellDevices(id, when);
-    tellWanted(id, when);
+    reportDevices(id, when);
+    reportWanted(id, when);
 }
 
-void Graph::tellWanted(ObjectID id, Moment when)
+void Graph::reportWanted(ObjectID id, Moment when)
 {
     const auto found = nodes_.find(id);
     if (found == nodes_.end() || !found->second.isDevice)
@@ -263,7 +263,7 @@ void Graph::tellWanted(ObjectID id, Moment when)
     deviceListener_.deviceWanted(found->second.serial, std::ranges::any_of(links_, touches), when);
 }
 
-void Graph::tellDevices(ObjectID id, Moment when)
+void Graph::reportDevices(ObjectID id, Moment when)
 {
     if (const auto* node = appearedStream(id))
         listener_.devicesChanged(node->serial, devicesOf(id), when);

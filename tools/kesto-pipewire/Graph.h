@@ -97,10 +97,10 @@ private:
     [[nodiscard]] bool isSettingOff(ObjectID node, Moment when) const;
     [[nodiscard]] std::string applicationOf(const Node& node, const Identity& own) const;
     [[nodiscard]] std::string devicesOf(ObjectID node) const;
-    void tellCycle(const NodeCycle& cycle);
-    void tellLinks(ObjectID node, Moment when);
-    void tellDevices(ObjectID node, Moment when);
-    void tellWanted(ObjectID node, Moment when);
+    void reportCycle(const NodeCycle& cycle);
+    void reportLinks(ObjectID node, Moment when);
+    void reportDevices(ObjectID node, Moment when);
+    void reportWanted(ObjectID node, Moment when);
     void removeNode(ObjectID node, Moment when);
 
     StreamListener& listener_;

@@ -17,8 +17,8 @@ constexpr std::size_t queueBytes = 1024 * 1024; // some thousands of messages, f
 constexpr auto longestFarewell = std::chrono::seconds(3);
 
 // Codes in the kernel's trace, with the session as argument: Start and Stop of a stream.
-constexpr std::uint32_t streamBegins = 0x21044080;
-constexpr std::uint32_t streamCeases = 0x21044084;
+constexpr std::uint32_t streamStarts = 0x21044080;
+constexpr std::uint32_t streamStops = 0x21044084;
 
 std::string textOf(const Payload& payload)
 {
@@ -85,14 +85,14 @@ void LibkestoService::handleState()
     // One signal may stand for a loss and the next connection.
     if (const auto connections = connections_.load(); std::exchange(handledConnections_, connections) != connections) {
         diagnostics_.say("connected to the reporting service");
-        saidThatItIsAway_ = false;
+        hasReportedAbsence_ = false;
         handlers_.lost();
         if (isConnected_)
             handlers_.appeared();
     }
     if (isConnected_)
         return;
-    if (!std::exchange(saidThatItIsAway_, true))
+    if (!std::exchange(hasReportedAbsence_, true))
         diagnostics_.say("waiting for the reporting service");
     handlers_.lost();
 }
@@ -139,9 +139,9 @@ void LibkestoService::start(ReporterID session)
 void LibkestoService::send(ReporterID session, Category category, EventType type, const Payload& message)
 {
     if (type == EventType::Start)
-        tracer_.emit(streamBegins, static_cast<std::uint64_t>(session));
+        tracer_.emit(streamStarts, static_cast<std::uint64_t>(session));
     else if (type == EventType::Stop)
-        tracer_.emit(streamCeases, static_cast<std::uint64_t>(session));
+        tracer_.emit(streamStops, static_cast<std::uint64_t>(session));
     note(session, client_.send(encode(message), category, type, session), [&] {
         return fmt::format("{} {}: {}", KestoReportingUtilityCategoryString(static_cast<AudioEventCategory>(category)),
                            KestoReportingUtilityTypeString(static_cast<AudioEventType>(type)), textOf(message));

@@ -56,7 +56,7 @@ private:
     std::atomic<std::uint64_t> connections_ = 0; // the number of connections so far
     std::atomic<bool> isConnected_ = false;
     std::uint64_t handledConnections_ = 0;
-    bool saidThatItIsAway_ = false;
+    bool hasReportedAbsence_ = false;
     std::uint64_t refusedCalls_ = 0;
     kesto::Message message_; // used for every call, so that calls do not allocate
     kesto::Tracer tracer_; // emits nothing while no trace runs

@@ -185,7 +185,7 @@ std::optional<StreamFormat> readFormat(const spa_pod& format)
     return result;
 }
 
-void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& tell)
+void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& handle)
 {
     if (!spa_pod_is_struct(&profile))
         return;
@@ -211,7 +211,7 @@ void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>&
             cycle.began = driver->signal;
             cycle.driver = nodeCycleOf(*driver, false); // its own status is that of the cycle that is being reported
         }
-        tell(cycle);
+        handle(cycle);
     });
 }
 

@@ -25,6 +25,6 @@ namespace kesto_pipewire {
 
 // Calls back for every cycle that the profiler reports. A record without a new signal for the driver, which comes when
 // a driver starts after a pause or a cycle was missed, is not a cycle. Any thread.
-void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& tell);
+void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& handle);
 
 } // namespace kesto_pipewire

@@ -84,7 +84,7 @@ template <typename Action> void Reporter::update(StreamSerial serial, Moment whe
     if (found == streams_.end())
         return;
     action(found->second);
-    tellDue(found->second, when);
+    reportDue(found->second, when);
     setAlarm();
 }
 
@@ -102,8 +102,8 @@ void Reporter::appeared(StreamSerial serial, const StreamDescription& descriptio
 void Reporter::runningChanged(StreamSerial serial, bool running, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
-        if (!running && stream.running.current && !stream.running.told)
-            tellChanges(stream, infinity); // even the shortest run is reported
+        if (!running && stream.running.current && !stream.running.reported)
+            reportChanges(stream, infinity); // even the shortest run is reported
         stream.running.observe(running, when);
     });
 }
@@ -126,7 +126,7 @@ void Reporter::devicesChanged(StreamSerial serial, const std::string& devices, M
 void Reporter::cycleWasLate(StreamSerial serial, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
-        if (!stream.running.told)
+        if (!stream.running.reported)
             return;
         if (!stream.episode)
             stream.episode = Episode{when, when, 0};
@@ -139,10 +139,10 @@ void Reporter::gone(StreamSerial serial, Moment when)
 {
     update(serial, when, [&](Stream& stream) {
         if (stream.devices.current.empty())
-            stream.devices.current = stream.devices.told; // its links have gone with it
-        tellChanges(stream, infinity);
+            stream.devices.current = stream.devices.reported; // its links have gone with it
+        reportChanges(stream, infinity);
         stream.running.observe(false, when);
-        tellChanges(stream, infinity);
+        reportChanges(stream, infinity);
         closeSession(stream, when);
     });
     streams_.erase(serial);
@@ -154,17 +154,17 @@ void Reporter::gone(StreamSerial serial, Moment when)
 Reporter::Changes Reporter::changesOf(const Stream& stream)
 {
     Changes changes;
-    const auto add = [&changes](const auto& fact, auto tell, Moment when, double due) {
+    const auto add = [&changes](const auto& fact, auto report, Moment when, double due) {
         if (!fact.isPending())
             return;
         const auto place =
             std::ranges::upper_bound(changes, when.uptime, {}, [](const Change& change) { return change.when.uptime; });
-        changes.insert(place, {tell, when, std::min(due, fact.pendingSince.uptime + longestHold)});
+        changes.insert(place, {report, when, std::min(due, fact.pendingSince.uptime + longestHold)});
     };
     const auto& [running, volume, format, devices] =
         std::tie(stream.running, stream.volume, stream.format, stream.devices);
     const auto startsAtOnce = running.current && (stream.runs > 0 || stream.isKnownWhole());
-    add(running, &Reporter::tellRunning, running.changedAt,
+    add(running, &Reporter::reportRunning, running.changedAt,
         running.changedAt.uptime + (startsAtOnce ? 0 : settlingTime));
     if (stream.runs == 0)
         return changes; // the first Start reports the others
@@ -172,10 +172,10 @@ Reporter::Changes Reporter::changesOf(const Stream& stream)
     // A stream stops a moment after its device has gone; its Stop still names that device.
     const auto stopsForIt = devices.current.empty() && running.isPending() && !running.current;
     const auto moved = stopsForIt ? later(devices.changedAt, running.changedAt) : devices.changedAt;
-    add(volume, &Reporter::tellVolume, volume.changedAt,
-        std::max(volume.changedAt.uptime, volume.toldSince.uptime + volumeInterval));
-    add(format, &Reporter::tellFormat, format.changedAt, format.changedAt.uptime + settlingTime);
-    add(devices, &Reporter::tellDevices, moved, moved.uptime + settlingTime);
+    add(volume, &Reporter::reportVolume, volume.changedAt,
+        std::max(volume.changedAt.uptime, volume.reportedSince.uptime + volumeInterval));
+    add(format, &Reporter::reportFormat, format.changedAt, format.changedAt.uptime + settlingTime);
+    add(devices, &Reporter::reportDevices, moved, moved.uptime + settlingTime);
     return changes;
 }
 
@@ -192,17 +192,17 @@ std::optional<double> Reporter::episodeDue(const Stream& stream)
     return std::min(stream.episode->last.uptime + quietTime, stream.episode->first.uptime + longestEpisode);
 }
 
-void Reporter::tellDue(Stream& stream, Moment now)
+void Reporter::reportDue(Stream& stream, Moment now)
 {
     if (episodeDue(stream).value_or(infinity) <= now.uptime)
-        tellEpisode(stream);
-    tellChanges(stream, now.uptime);
+        reportEpisode(stream);
+    reportChanges(stream, now.uptime);
 }
 
 void Reporter::settle(Moment now)
 {
     for (auto& [serial, stream] : streams_)
-        tellDue(stream, now);
+        reportDue(stream, now);
     alarmTime_.reset(); // it has gone off
     setAlarm();
 }
@@ -219,48 +219,49 @@ void Reporter::setAlarm()
 
 // Reports.
 
-void Reporter::tellChanges(Stream& stream, double dueUntil)
+void Reporter::reportChanges(Stream& stream, double dueUntil)
 {
     for (const auto& change : changesOf(stream)) {
         if (change.due > dueUntil)
             return;
-        (this->*change.tell)(stream, change.when);
+        (this->*change.report)(stream, change.when);
     }
 }
 
-void Reporter::tellRunning(Stream& stream, Moment when)
+void Reporter::reportRunning(Stream& stream, Moment when)
 {
-    tellEpisode(stream);
-    stream.running.tell(when);
-    if (stream.running.told && ++stream.runs == 1) {
-        stream.volume.tell(when);
-        stream.format.tell(when);
-        stream.devices.tell(when);
+    reportEpisode(stream);
+    stream.running.setReported(when);
+    if (stream.running.reported && ++stream.runs == 1) {
+        stream.volume.setReported(when);
+        stream.format.setReported(when);
+        stream.devices.setReported(when);
     }
     sendRunning(stream, when);
 }
 
-void Reporter::tellVolume(Stream& stream, Moment when)
+void Reporter::reportVolume(Stream& stream, Moment when)
 {
-    stream.volume.tell(when);
-    send(stream, Category::Volume, EventType::State, {{"PomoSessionVolume", *stream.volume.told}}, when);
+    stream.volume.setReported(when);
+    send(stream, Category::Volume, EventType::State, {{"PomoSessionVolume", *stream.volume.reported}}, when);
 }
 
-void Reporter::tellFormat(Stream& stream, Moment when)
+void Reporter::reportFormat(Stream& stream, Moment when)
 {
-    stream.format.tell(when);
+    stream.format.setReported(when);
     Payload message;
-    append(message, stream.format.told);
+    append(message, stream.format.reported);
     send(stream, Category::Setup, EventType::State, std::move(message), when);
 }
 
-void Reporter::tellDevices(Stream& stream, Moment when)
+void Reporter::reportDevices(Stream& stream, Moment when)
 {
-    stream.devices.tell(when);
-    send(stream, Category::RouteChange, EventType::State, {{"active_devices", devicesText(stream.devices.told)}}, when);
+    stream.devices.setReported(when);
+    send(stream, Category::RouteChange, EventType::State, {{"active_devices", devicesText(stream.devices.reported)}},
+         when);
 }
 
-void Reporter::tellEpisode(Stream& stream)
+void Reporter::reportEpisode(Stream& stream)
 {
     const auto episode = std::exchange(stream.episode, std::nullopt);
     if (!episode)
@@ -269,21 +270,22 @@ void Reporter::tellEpisode(Stream& stream)
          {{"issue", "late_cycles"},
           {"late_cycles", episode->cycles},
           {"issue_duration", roundedToMilliseconds(episode->last.uptime - episode->first.uptime)},
-          {"active_devices", devicesText(stream.devices.told)}},
+          {"active_devices", devicesText(stream.devices.reported)}},
          episode->last);
 }
 
 void Reporter::sendRunning(const Stream& stream, Moment when)
 {
     const auto isOutput = stream.description.direction == Direction::Output;
-    Payload message{{isOutput ? "session_output_running" : "session_input_running", stream.running.told}};
-    append(message, stream.format.told);
-    message.emplace_back("active_devices", devicesText(stream.devices.told));
-    if (stream.volume.told)
-        message.emplace_back("PomoSessionVolume", *stream.volume.told);
+    Payload message{{isOutput ? "session_output_running" : "session_input_running", stream.running.reported}};
+    append(message, stream.format.reported);
+    message.emplace_back("active_devices", devicesText(stream.devices.reported));
+    if (stream.volume.reported)
+        message.emplace_back("PomoSessionVolume", *stream.volume.reported);
     // Without it a second Start would repeat the first, and the service drops repetitions.
     message.emplace_back("session_run", stream.runs);
-    send(stream, stream.category(), stream.running.told ? EventType::Start : EventType::Stop, std::move(message), when);
+    send(stream, stream.category(), stream.running.reported ? EventType::Start : EventType::Stop, std::move(message),
+         when);
 }
 
 void Reporter::send(const Stream& stream, Category category, EventType type, Payload message, Moment when)
@@ -304,10 +306,10 @@ void Reporter::serviceAppeared()
         openSession(stream);
         // The state is reported with the time since which it has not changed; the service got all earlier changes
         // before it went.
-        if (stream.running.told)
+        if (stream.running.reported)
             sendRunning(stream,
-                        later(later(stream.running.toldSince, stream.volume.toldSince),
-                              later(stream.format.toldSince, stream.devices.toldSince)));
+                        later(later(stream.running.reportedSince, stream.volume.reportedSince),
+                              later(stream.format.reportedSince, stream.devices.reportedSince)));
     }
 }
 

@@ -58,9 +58,9 @@ private:
     // A value that changes: the current one and the last reported one.
     template <typename Value> struct Fact {
         Value current{};
-        Value told{};
+        Value reported{};
         Moment changedAt; // when the current value began
-        Moment toldSince; // when the reported value began
+        Moment reportedSince; // when the reported value began
         Moment pendingSince; // since when the two differ
 
         void observe(Value value, Moment when)
@@ -72,11 +72,11 @@ private:
             current = std::move(value);
             changedAt = when;
         }
-        [[nodiscard]] bool isPending() const { return current != told; }
-        void tell(Moment since)
+        [[nodiscard]] bool isPending() const { return current != reported; }
+        void setReported(Moment since)
         {
-            told = current;
-            toldSince = since;
+            reported = current;
+            reportedSince = since;
         }
     };
 
@@ -103,7 +103,7 @@ private:
 
     // A difference between a current and a reported value.
     struct Change {
-        void (Reporter::*tell)(Stream&, Moment);
+        void (Reporter::*report)(Stream&, Moment);
         Moment when;
         double due = 0; // the earliest uptime of its report; earlier changes go first
     };
@@ -117,13 +117,13 @@ private:
     template <typename Action> void update(StreamSerial serial, Moment when, Action action);
     void setAlarm();
 
-    void tellDue(Stream& stream, Moment now);
-    void tellChanges(Stream& stream, double dueUntil);
-    void tellRunning(Stream& stream, Moment when);
-    void tellVolume(Stream& stream, Moment when);
-    void tellFormat(Stream& stream, Moment when);
-    void tellDevices(Stream& stream, Moment when);
-    void tellEpisode(Stream& stream);
+    void reportDue(Stream& stream, Moment now);
+    void reportChanges(Stream& stream, double dueUntil);
+    void reportRunning(Stream& stream, Moment when);
+    void reportVolume(Stream& stream, Moment when);
+    void reportFormat(Stream& stream, Moment when);
+    void reportDevices(Stream& stream, Moment when);
+    void reportEpisode(Stream& stream);
 
     void openSession(const Stream& stream);
     void closeSession(const Stream& stream, Moment when);

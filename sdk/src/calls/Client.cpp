@@ -87,7 +87,7 @@ kesto_status kesto_client::call(CallHead head) noexcept
     libkesto::Callback callback(head.callback); // released here unless it is handed over
     if (const kesto_status status = refusal(); status != KESTO_OK)
         return status;
-    if (courier_.isTellingState() && isOwnThread()) {
+    if (courier_.isReportingState() && isOwnThread()) {
         if (const kesto_status status = courier_.putFirst(head, {}, {}); status != KESTO_OK)
             return status;
     } else if (!mailbox_.putCall(head)) {
@@ -142,7 +142,7 @@ kesto_status kesto_client::send(const libkesto::MessageEncoder& message, CallHea
     }
     head.entryCount = message.entryCount();
     head.reporterCount = static_cast<std::uint32_t>(reporters.size());
-    if (courier_.isTellingState() && isOwnThread())
+    if (courier_.isReportingState() && isOwnThread())
         status = courier_.putFirst(head, bytesOf(reporters), message.entries());
     else if (!mailbox_.putMessage(head, bytesOf(reporters), message.entries()))
         status = KESTO_QUEUE_FULL;

@@ -258,9 +258,9 @@ void Courier::changeState(kesto_state state, ConnectionFailure failure)
         const auto until = std::chrono::ceil<Milliseconds>(*retryAt_ - Clock::now());
         retryAfter = static_cast<std::uint32_t>(std::max<std::int64_t>(0, until.count()));
     }
-    isTellingState_.store(true, std::memory_order_relaxed);
+    isReportingState_.store(true, std::memory_order_relaxed);
     settings_.stateChanged({state, failure.reason, failure.systemError, retryAfter, connection_.path().c_str()});
-    isTellingState_.store(false, std::memory_order_relaxed);
+    isReportingState_.store(false, std::memory_order_relaxed);
 }
 
 } // namespace libkesto

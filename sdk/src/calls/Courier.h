@@ -48,7 +48,7 @@ public:
 
     // Whether the state callback is running. Its calls, on the client's thread, go ahead of those in the mailbox: a
     // message that was sent while the client was connecting then finds the sessions that the callback creates.
-    [[nodiscard]] bool isTellingState() const noexcept { return isTellingState_.load(std::memory_order_relaxed); }
+    [[nodiscard]] bool isReportingState() const noexcept { return isReportingState_.load(std::memory_order_relaxed); }
     // Takes over the callback and the configuration's entries if it returns KESTO_OK. The client's thread.
     [[nodiscard]] kesto_status putFirst(const CallHead& head, std::string_view reporters,
                                         std::string_view entries) noexcept;
@@ -81,7 +81,7 @@ private:
     Counters& counters_;
     std::atomic<kesto_state> state_ = KESTO_STATE_CONNECTING;
     std::atomic<bool> isStopping_ = false;
-    std::atomic<bool> isTellingState_ = false;
+    std::atomic<bool> isReportingState_ = false;
 
     // Only for the client's thread.
     ServiceConnection connection_;

@@ -222,16 +222,16 @@ private:
         auto reading = tree_.read(options_.selection);
         ReportingSample sample{.channels = {}, .isWhole = reading && reading->leftOut.isNothing()};
         if (reading) {
-            tellProblems(std::move(reading->problems));
-            tellOnce(reading->leftOut.inWords({}), limits_);
+            reportProblems(std::move(reading->problems));
+            reportOnce(reading->leftOut.inWords({}), limits_);
             sample.channels = std::move(reading->channels);
         }
-        tellOnce(reading ? Lines() : Lines{options_.root.native() + ": " + reading.error().message()}, failure_);
+        reportOnce(reading ? Lines() : Lines{options_.root.native() + ": " + reading.error().message()}, failure_);
         std::ranges::move(soundCards_.read(options_.selection), std::back_inserter(sample.channels));
         return sample;
     }
 
-    void tellProblems(std::vector<platform::ChannelProblem> problems)
+    void reportProblems(std::vector<platform::ChannelProblem> problems)
     {
         std::ranges::sort(problems);
         for (const auto& problem : problems)
@@ -240,12 +240,12 @@ private:
         problems_ = std::move(problems);
     }
 
-    static void tellOnce(Lines lines, Lines& told)
+    static void reportOnce(Lines lines, Lines& reported)
     {
-        if (lines != told)
+        if (lines != reported)
             for (const std::string& line : lines)
                 fmt::print(stderr, "kesto: {}\n", line);
-        told = std::move(lines);
+        reported = std::move(lines);
     }
 
     void print(const ReportingSample& sample) const

@@ -140,7 +140,7 @@ std::optional<int> run(const std::vector<std::string>& command)
     return WIFEXITED(status) ? WEXITSTATUS(status) : signalled + WTERMSIG(status);
 }
 
-void tell(const std::exception& exception)
+void report(const std::exception& exception)
 {
     fmt::print(stderr, "kesto: {}\n", exception.what());
 }
@@ -154,7 +154,7 @@ int show(TraceResultsPlace& results, const fs::path& output)
         if (!output.empty())
             writeOutput(output, text);
     } catch (const std::exception& exception) { // the results are shown all the same
-        tell(exception);
+        report(exception);
         status = exitFailure;
     }
     const int shown = showTraceResults(traceResultsOf(text, results.path()), false);
@@ -184,7 +184,7 @@ int recordTrace(const TraceRecordingOptions& options)
         session.stop();
         status = show(results, options.output);
     } catch (const std::exception& exception) {
-        tell(exception);
+        report(exception);
     }
     return *ended == exitOk ? status : *ended;
 }

@@ -8,28 +8,28 @@
 
 namespace platform {
 
-ChannelComplaints::Memory ChannelComplaints::addQuestion()
+ChannelComplaints::Memory ChannelComplaints::addQuery()
 {
     const foundation::Lock lock(lock_);
     return memories_.emplace_back(std::make_shared<Findings>());
 }
 
-void ChannelComplaints::forgetDroppedQuestions()
+void ChannelComplaints::forgetDroppedQueries()
 {
     const foundation::Lock lock(lock_);
     std::erase_if(memories_, [](const Memory& memory) { return memory.use_count() == 1; });
 }
 
-void ChannelComplaints::tell(Findings found, const Memory& memory)
+void ChannelComplaints::report(Findings found, const Memory& memory)
 {
     std::ranges::sort(found.problems);
     const foundation::Lock lock(lock_);
-    sayProblems(found.problems);
-    sayWhatIsLeftOut(found.leftOut);
+    logProblems(found.problems);
+    logLeftOut(found.leftOut);
     *memory = std::move(found);
 }
 
-void ChannelComplaints::tellUnreadable(std::error_code error, const Memory& memory)
+void ChannelComplaints::reportUnreadable(std::error_code error, const Memory& memory)
 {
     const foundation::Lock lock(lock_);
     if (!anyRemembers([error](const Findings& each) { return each.error == error; }))
@@ -43,7 +43,7 @@ template <typename Condition> bool ChannelComplaints::anyRemembers(Condition con
     return std::ranges::any_of(memories_, [&](const Memory& memory) { return condition(*memory); });
 }
 
-void ChannelComplaints::sayProblems(const std::vector<ChannelProblem>& problems) const
+void ChannelComplaints::logProblems(const std::vector<ChannelProblem>& problems) const
 {
     std::size_t count = 0;
     for (const ChannelProblem& problem : problems) {
@@ -56,7 +56,7 @@ void ChannelComplaints::sayProblems(const std::vector<ChannelProblem>& problems)
         log_.error("{} more channels are left out", count - mostNamed);
 }
 
-void ChannelComplaints::sayWhatIsLeftOut(LeftOutChannels leftOut) const
+void ChannelComplaints::logLeftOut(LeftOutChannels leftOut) const
 {
     for (std::size_t LeftOutChannels::* bound :
          {&LeftOutChannels::beyondChannels, &LeftOutChannels::beyondBytes, &LeftOutChannels::beyondNames})

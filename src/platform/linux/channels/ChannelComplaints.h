@@ -35,18 +35,19 @@ public:
     {
     }
 
-    [[nodiscard]] Memory addQuestion();
+    // Adds a query, which has no findings yet.
+    [[nodiscard]] Memory addQuery();
     // Logs the new findings, and keeps all.
-    void tell(Findings found, const Memory& memory);
+    void report(Findings found, const Memory& memory);
     // Logs that the tree could not be read, and keeps its earlier findings until it can be read.
-    void tellUnreadable(std::error_code error, const Memory& memory);
+    void reportUnreadable(std::error_code error, const Memory& memory);
     // Forgets the findings of queries without owners.
-    void forgetDroppedQuestions();
+    void forgetDroppedQueries();
 
 private:
     template <typename Condition> [[nodiscard]] bool anyRemembers(Condition condition) const KESTO_REQUIRES(lock_);
-    void sayProblems(const std::vector<ChannelProblem>& problems) const KESTO_REQUIRES(lock_);
-    void sayWhatIsLeftOut(LeftOutChannels leftOut) const KESTO_REQUIRES(lock_);
+    void logProblems(const std::vector<ChannelProblem>& problems) const KESTO_REQUIRES(lock_);
+    void logLeftOut(LeftOutChannels leftOut) const KESTO_REQUIRES(lock_);
 
     const std::filesystem::path root_;
     const ChannelTree::Limits limits_;

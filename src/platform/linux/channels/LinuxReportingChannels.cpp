@@ -22,12 +22,12 @@ ReportingChannels::FoundChannels LinuxReportingChannels::copyChannelsInGroup(std
     const auto found = std::make_shared<Selection>();
     found->selection = {std::optional<std::string>(group), std::optional<std::string>(subgroup)};
     found->count = soundCards_.read(found->selection).size();
-    found->memory = complaints_.addQuestion();
+    found->memory = complaints_.addQuery();
     auto reading = tree_.read(found->selection);
     if (!reading)
         return {.channels = found, .error = reading.error().value()};
     found->count += reading->channels.size();
-    complaints_.tell({.problems = std::move(reading->problems), .leftOut = reading->leftOut}, found->memory);
+    complaints_.report({.problems = std::move(reading->problems), .leftOut = reading->leftOut}, found->memory);
     return {.channels = found, .error = {}};
 }
 
@@ -47,7 +47,7 @@ std::expected<ReportingSample, ReportingChannelError> LinuxReportingChannels::cr
                                                                                             const ChannelSet& channels)
 {
     const auto& subscribed = dynamic_cast<const Selection&>(channels);
-    complaints_.forgetDroppedQuestions(); // not earlier: at its start the service makes one query after the other
+    complaints_.forgetDroppedQueries(); // not earlier: at its start the service makes one query after the other
     auto reading = tree_.read(subscribed.selection);
     auto ofSoundCards = soundCards_.read(subscribed.selection);
     if (!reading && ofSoundCards.empty())
@@ -55,9 +55,9 @@ std::expected<ReportingSample, ReportingChannelError> LinuxReportingChannels::cr
     ReportingSample sample{.channels = {}, .isWhole = reading && reading->leftOut.isNothing()};
     if (reading) {
         sample.channels = std::move(reading->channels);
-        complaints_.tell({.problems = std::move(reading->problems), .leftOut = reading->leftOut}, subscribed.memory);
+        complaints_.report({.problems = std::move(reading->problems), .leftOut = reading->leftOut}, subscribed.memory);
     } else {
-        complaints_.tellUnreadable(reading.error(), subscribed.memory);
+        complaints_.reportUnreadable(reading.error(), subscribed.memory);
     }
     std::ranges::move(ofSoundCards, std::back_inserter(sample.channels));
     return sample;

@@ -167,7 +167,7 @@ void ConfigurationWatcher::handleEvents()
                  || place->second.awaited.contains(fileName))
             structureChanged = true;
         else if (!fileName.empty())
-            tell(place->second.directory, fileName, (event.mask & writesOfFiles) != 0);
+            callHandlers(place->second.directory, fileName, (event.mask & writesOfFiles) != 0);
     }
     if (!structureChanged && !eventsWereLost)
         return;
@@ -177,7 +177,7 @@ void ConfigurationWatcher::handleEvents()
             watch->handler_({});
 }
 
-void ConfigurationWatcher::tell(const fs::path& directory, std::string_view fileName, bool isWrite)
+void ConfigurationWatcher::callHandlers(const fs::path& directory, std::string_view fileName, bool isWrite)
 {
     for (const Watch* watch : watches_)
         if (watch->directory_ == directory && (isWrite || watch->changes_ == Changes::All))

@@ -89,7 +89,8 @@ private:
     Place* add(std::filesystem::path& directory, std::string& missing) KESTO_REQUIRES(lock_);
     void run();
     void handleEvents();
-    void tell(const std::filesystem::path& directory, std::string_view fileName, bool isWrite) KESTO_REQUIRES(lock_);
+    void callHandlers(const std::filesystem::path& directory, std::string_view fileName, bool isWrite)
+        KESTO_REQUIRES(lock_);
     void complain(std::string_view what, int systemError);
 
     const std::filesystem::path root_;

@@ -6,8 +6,8 @@ namespace platform {
 EventLosses::~EventLosses()
 {
     for (std::size_t reason = 0; reason < storeErrorCount; ++reason)
-        if (losses_[reason].told < losses_[reason].events)
-            tell(static_cast<StoreError>(reason), losses_[reason]);
+        if (losses_[reason].reported < losses_[reason].events)
+            log(static_cast<StoreError>(reason), losses_[reason]);
 }
 
 void EventLosses::add(StoreError reason, std::uint64_t events)
@@ -20,20 +20,20 @@ void EventLosses::report()
     const double now = clock_.systemUptime();
     for (std::size_t reason = 0; reason < storeErrorCount; ++reason) {
         Loss& loss = losses_[reason];
-        const bool isDue = loss.told == 0 || now - loss.toldAt >= secondsBetweenLines;
-        if (loss.told < loss.events && isDue)
-            tell(static_cast<StoreError>(reason), loss);
+        const bool isDue = loss.reported == 0 || now - loss.reportedAt >= secondsBetweenLines;
+        if (loss.reported < loss.events && isDue)
+            log(static_cast<StoreError>(reason), loss);
     }
 }
 
-void EventLosses::tell(StoreError reason, Loss& loss)
+void EventLosses::log(StoreError reason, Loss& loss)
 {
     const auto [problem, remedy] = words(reason);
     const std::uint64_t events = loss.events;
-    log_.error("{} analytics events were lost ({} since the start): {}: {}; {}", events - loss.told, events,
+    log_.error("{} analytics events were lost ({} since the start): {}: {}; {}", events - loss.reported, events,
                path_.native(), problem, remedy);
-    loss.told = events;
-    loss.toldAt = clock_.systemUptime();
+    loss.reported = events;
+    loss.reportedAt = clock_.systemUptime();
 }
 
 } // namespace platform

@@ -43,11 +43,11 @@ public:
 private:
     struct Loss {
         std::atomic<std::uint64_t> events = 0;
-        std::uint64_t told = 0;
-        double toldAt = 0; // the time of the last report (uptime, in seconds)
+        std::uint64_t reported = 0;
+        double reportedAt = 0; // the time of the last report (uptime, in seconds)
     };
 
-    void tell(StoreError reason, Loss& loss);
+    void log(StoreError reason, Loss& loss);
 
     const std::filesystem::path path_;
     const Clock& clock_;

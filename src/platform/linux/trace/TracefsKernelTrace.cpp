@@ -169,7 +169,7 @@ int TracefsKernelTrace::start(const std::shared_ptr<TraceSubscription>& subscrip
     if (!fanOut_.add(subscription))
         return EMFILE;
     subscription->startTime = traceTime(Clock::now());
-    tellEmitters();
+    updateEmitters();
     changed_.notifyAll();
     return 0;
 }
@@ -200,11 +200,11 @@ void TracefsKernelTrace::switchOff()
     isOn_ = false;
     merger_.reset(); // releases its memory
     instance_->switchOff();
-    tellEmitters();
+    updateEmitters();
 }
 
 // Lets emitters skip events while no session needs them.
-void TracefsKernelTrace::tellEmitters()
+void TracefsKernelTrace::updateEmitters()
 {
     const bool isTracing = isOn_ && fanOut_.isWanted();
     emitter_.setMarker(isTracing ? instance_->marker() : -1);
@@ -219,7 +219,7 @@ void TracefsKernelTrace::end(const std::shared_ptr<TraceSubscription>& subscript
     subscription->endTime = traceTime(Clock::now());
     if (!subscription->hasStarted())
         return fanOut_.complete(subscription);
-    tellEmitters();
+    updateEmitters();
     changed_.notifyAll();
 }
 
@@ -229,7 +229,7 @@ void TracefsKernelTrace::remove(TraceSubscription& subscription)
     subscription.isDestroyed = true;
     fanOut_.remove(subscription);
     if (isOn_)
-        tellEmitters();
+        updateEmitters();
     changed_.notifyAll();
 }
 

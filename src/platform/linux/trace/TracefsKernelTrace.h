@@ -69,7 +69,7 @@ private:
 
     [[nodiscard]] int switchOn() KESTO_REQUIRES(lock_);
     void switchOff() KESTO_REQUIRES(lock_);
-    void tellEmitters() KESTO_REQUIRES(lock_);
+    void updateEmitters() KESTO_REQUIRES(lock_);
     void run();
     [[nodiscard]] Clock::time_point nextReading() const KESTO_REQUIRES(lock_);
     void read() KESTO_REQUIRES(lock_);
