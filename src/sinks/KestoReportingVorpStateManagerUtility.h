@@ -1,5 +1,7 @@
 // Watches for haptics hardware that keeps running: if a second, different report of haptic hardware time comes after a
 // first one, a session has probably leaked, and this class requests a snapshot from the bug-capture service.
+//
+// The system's model gives both names: the file's ends in Utility, the class's has it in the middle.
 #pragma once
 
 #include "platform/BugCapture.h"

@@ -1,4 +1,5 @@
-// The values that events of one code carry in one of their arguments.
+// The values that events of one code carry in one of their arguments. It is part of the model of traces; no parameters
+// file of this service asks for one, so only tests make it.
 #pragma once
 
 #include "tracing/TraceData.h"

@@ -1,5 +1,5 @@
 // The headless-pipewire script does the work; this file starts and ends it.
-#include "tools/pipewire/HeadlessPipeWire.h"
+#include "tools/kesto-pipewire/HeadlessPipeWire.h"
 
 #include <gtest/gtest.h>
 

@@ -1,7 +1,7 @@
 // The reports about streams, with streams and a clock that only exist in these tests.
 
 #include "kesto-pipewire/Reporter.h"
-#include "tools/pipewire/FakeReportingService.h"
+#include "tools/kesto-pipewire/FakeReportingService.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

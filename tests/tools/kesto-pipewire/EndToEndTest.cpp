@@ -2,7 +2,7 @@
 
 #include "support/Sanitizers.h"
 #include "support/TemporaryDirectory.h"
-#include "tools/pipewire/HeadlessPipeWire.h"
+#include "tools/kesto-pipewire/HeadlessPipeWire.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

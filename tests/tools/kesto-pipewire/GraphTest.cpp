@@ -1,8 +1,8 @@
 // The graph of streams, with every order of events that a server may send.
 
 #include "kesto-pipewire/Graph.h"
-#include "tools/pipewire/RecordingDeviceListener.h"
-#include "tools/pipewire/RecordingStreamListener.h"
+#include "tools/kesto-pipewire/RecordingDeviceListener.h"
+#include "tools/kesto-pipewire/RecordingStreamListener.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>

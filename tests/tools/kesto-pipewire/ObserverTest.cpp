@@ -1,8 +1,8 @@
 // The observer's reports of real streams on a real PipeWire without hardware.
 
 #include "kesto-pipewire/Observer.h"
-#include "tools/pipewire/HeadlessPipeWire.h"
-#include "tools/pipewire/RecordingDeviceListener.h"
+#include "tools/kesto-pipewire/HeadlessPipeWire.h"
+#include "tools/kesto-pipewire/RecordingDeviceListener.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
