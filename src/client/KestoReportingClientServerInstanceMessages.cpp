@@ -1,6 +1,6 @@
 // Delivering a message to each of its sessions, and beside each session to every sink.
 //
-// With a list of reporters the sinks come first and the session last; without one, the session comes first.
+// A message to every started session reaches each session before its sinks; in all other cases the sinks come first.
 // Both orders are part of the contract.
 #include "client/KestoReportingClientServerInstance.h"
 #include "foundation/text/Format.h"

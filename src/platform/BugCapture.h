@@ -12,7 +12,7 @@
 
 namespace platform {
 
-// One conversation with the service. Its functions never block on the disk.
+// One conversation with the service. Its functions never block on the disk. One thread at a time.
 class BugCaptureReporter {
 public:
     using Reply = std::move_only_function<void(foundation::Dictionary response)>;
@@ -24,7 +24,8 @@ public:
                   std::string_view subtypeContext, std::string_view detectedProcess,
                   const std::optional<foundation::Value>& triggerThresholdValues);
     // The reply comes later, once, on a queue that the service chooses, even if no snapshot is taken or the reporter
-    // has been destroyed. Its "success" tells whether a snapshot was taken.
+    // has been destroyed. Its "success" tells whether a snapshot was taken. The duration, in seconds, is kept with
+    // the snapshot.
     virtual void requestSnapshot(foundation::Dictionary signature, double duration,
                                  const std::optional<foundation::Value>& event,
                                  const std::optional<foundation::Value>& payload, Reply reply) = 0;

@@ -65,12 +65,12 @@ public:
     virtual void setInterruptionHandler(EndHandler handler) = 0;
     virtual void setInvalidationHandler(EndHandler handler) = 0;
 
-    // Starts reading.
+    // Starts reading. Connection thread, in `shouldAcceptNewConnection`.
     virtual void resume() = 0;
 
     // Sends one frame, an encoded CBOR item, to the peer: it leaves after the turn, once everything that the turn
     // stored is kept. Never blocks; what is sent to a connection that broke or is over, or is so before the frame could
-    // leave, is dropped.
+    // leave, is dropped. The thread that runs the turn.
     virtual void send(Turn& turn, std::string frame) = 0;
     // Writes a letter that `send` has filled. Never blocks. Any thread.
     virtual void write(std::string letter) = 0;
@@ -94,10 +94,12 @@ public:
 class ConnectionListener {
 public:
     virtual ~ConnectionListener() = default;
-    virtual void setDelegate(ConnectionListenerDelegate& delegate) = 0; // must outlive the listener's run
-    // Accepts connections; returns after `stop` (which only tests call). It invalidates the connections before it
+    // The delegate must outlive the listener's run. Call this before `resume`.
+    virtual void setDelegate(ConnectionListenerDelegate& delegate) = 0;
+    // Accepts connections, on the calling thread; returns after `stop`. It invalidates the connections before it
     // returns.
     virtual void resume() = 0;
+    // Makes `resume` return; only tests call it. Any thread.
     virtual void stop() = 0;
 };
 

@@ -1,8 +1,8 @@
 // Events on their way to the keeper, written in the form in which it stores them.
 //
-// A payload becomes JSON when its event is added, on the thread that built it: taken apart on another thread, every
-// string that it shares with other messages would wander between two processors. Only a large payload waits for the
-// thread that keeps the events, because clients wait for the one that adds it.
+// The thread that built a payload writes its JSON at once: done on another thread, its shared strings would move
+// between two processors. Only a large payload waits for the thread that keeps the events, because clients wait for the
+// thread that adds it.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -26,7 +26,7 @@ struct EventRow {
 // One thread at a time.
 class EventBatch {
 public:
-    // A payload that takes more, roughly, waits.
+    // In bytes of memory, roughly: a payload that takes more waits.
     static constexpr std::size_t largestWrittenAtOnce = 64 * 1024;
 
     // The time is in seconds since 1970 UTC.

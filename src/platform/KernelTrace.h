@@ -34,6 +34,9 @@ static_assert(sizeof(void*) != 8 || sizeof(KernelTraceEvent) == 96);
 // One trace session. Its handlers run on the queue of `start`, in the order of time. Its own completion handler may
 // destroy it. If it is destroyed before it is complete, its completion handler does not run; events that are already on
 // their way to the queue may still be delivered. Afterwards its handlers are released.
+//
+// One thread at a time until `start` has returned. After that, `end` and `timestampToNanoseconds` may be called on any
+// thread.
 class KernelTraceSession {
 public:
     virtual ~KernelTraceSession() = default;

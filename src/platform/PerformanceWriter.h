@@ -12,7 +12,8 @@ namespace platform {
 
 enum class PerformanceUnit : std::uint8_t { Nanoseconds };
 
-// An open file; its destructor flushes and closes it. Until then the older file of its name stays in place.
+// An open file; its destructor flushes and closes it. Until then the older file of its name stays in place. If writing
+// fails, it stays for good: the failure is logged when the file is closed. One thread at a time.
 class PerformanceFile {
 public:
     virtual ~PerformanceFile() = default;

@@ -14,18 +14,20 @@ namespace platform {
 
 enum class ChannelFormat : std::uint8_t { Invalid = 0, Simple = 1, State = 2, Histogram = 3 };
 
+// How often values fell into one range, in the channel's unit.
 struct HistogramBucket {
-    std::int64_t lower = 0;
-    std::int64_t upper = 0;
+    std::int64_t lower = 0; // included, in what libkesto publishes
+    std::int64_t upper = 0; // not included
     std::int64_t hits = 0;
     std::int32_t boundsError = 0; // not 0 if the bounds could not be read
 };
 
+// How often a channel entered a state, and for how long it was in it.
 struct StateResidency {
     std::string name;
     std::uint64_t transitions = 0;
-    std::uint64_t residency = 0;
-    double dutyCycle = 0;
+    std::uint64_t residency = 0; // the time in this state; its publisher chooses the unit, usually milliseconds
+    double dutyCycle = 0; // the share of this state in the time of all, 0 to 1
 };
 
 // One channel of a sample. Fields that its format does not have stay empty.
@@ -51,7 +53,10 @@ struct ReportingSample {
 
 using ReportingChannelError = std::int64_t; // the platform's error code
 
-// Calls that may return a result and an error side by side return both as they came.
+// If the platform returns a result and an error together, these functions return both.
+//
+// One thread at a time for each set of channels; otherwise any thread. Functions that look for channels or sample them
+// may wait for the disk.
 class ReportingChannels {
 public:
     // The platform's own data of a set of channels or a subscription.

@@ -29,7 +29,12 @@ namespace platform {
 using WorkItem = std::move_only_function<void()>;
 using TurnItem = std::move_only_function<void(Turn& turn)>;
 
-enum class QualityOfService : std::uint8_t { UserInteractive, Default, Background };
+// The priority of a queue's thread.
+enum class QualityOfService : std::uint8_t {
+    UserInteractive, // before the others: clients wait for its work
+    Default,
+    Background // after the others: only the results of its work matter, not when they come
+};
 
 // A queue that is destroyed, even by one of its own items, still runs what was submitted before. Any thread may submit.
 class WorkQueue {
@@ -50,7 +55,7 @@ public:
 
 // How a serial queue is run.
 struct SerialQueueOptions {
-    QualityOfService quality = QualityOfService::Default; // the priority of its thread
+    QualityOfService quality = QualityOfService::Default;
     bool mayBeHelped = false; // by a thread that submits, which then runs items itself
 
     friend bool operator==(const SerialQueueOptions&, const SerialQueueOptions&) = default;

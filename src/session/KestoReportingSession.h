@@ -83,7 +83,7 @@ public:
     [[nodiscard]] const TraceRunner* traceRunner() const { return traceRunner_.get(); }
     [[nodiscard]] const TraceParams* traceParams() const { return traceParams_.get(); }
 
-    // Called before the message's function returns, if at all.
+    // `sendMessage` calls it before it returns; `sendSingleMessage` never calls it.
     using MessageReply = std::function<void(const std::optional<utility::ReplyError>& error)>;
     // Normalises and records the message, then calls the reply, if there is one, without an error. `sync` has no
     // effect: the message is always handled before this returns, on the caller's thread. An absent message counts as an

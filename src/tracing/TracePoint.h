@@ -1,5 +1,5 @@
-// The values that events of one code carry in one of their arguments. It is part of the model of traces; no parameters
-// file of this service asks for one, so only tests make it.
+// The values that events of one code carry in one of their arguments. It is part of the model of traces. The runner of
+// this service makes intervals only, so only tests make it.
 #pragma once
 
 #include "tracing/TraceData.h"

@@ -217,7 +217,7 @@ bool Courier::looksByItself() const noexcept
     return !settings_.wakeOnSend && (!startedReporters_.empty() || calls_.unanswered() > 0);
 }
 
-// How long to wait for the socket and the doorbell. If messages have to ring, it first makes callers do so.
+// How long to sleep. If messages must ring to wake the thread, it first tells callers so.
 Courier::Milliseconds Courier::longestWait() noexcept
 {
     if (!canTakeCalls())

@@ -1,4 +1,5 @@
-// All providers of this system, made in the order of their dependencies.
+// All providers of this system, declared so that the queues end first: what a queue still runs finds every other
+// provider. Providers that are made before the queues only keep a reference to them while they are made.
 //
 //     auto launch = platform::LaunchConfiguration::fromEnvironment();
 //     if (!launch)

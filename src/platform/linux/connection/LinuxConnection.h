@@ -28,7 +28,7 @@ namespace platform {
 
 class LinuxConnection final : public Connection, public std::enable_shared_from_this<LinuxConnection> {
 public:
-    // Beyond either limit, the connection stops reading from the client; so one read may exceed it. A client may have
+    // The connection stops reading beyond either limit; the read that passes it is still taken in. A client may have
     // 10,000 sessions, and the start of each is unanswered until the session stops: the number is far above that.
     static constexpr std::uint32_t mostUnansweredCalls = 32 * 1024;
     static constexpr std::uint32_t mostUnansweredBytes = 1024 * 1024;

@@ -19,7 +19,7 @@ class LinuxMemory final : public Memory {
 public:
     // Fewer bytes are not worth waking threads for.
     static constexpr std::size_t much = std::size_t{4} << 20;
-    // Counts from the moment at which so many bytes are free since the threads last tidied their heaps.
+    // From the moment when `much` bytes are free until the heaps are tidied.
     static constexpr std::chrono::seconds delay{5};
 
     explicit LinuxMemory(WorkQueues& queues) : queues_(queues) { }

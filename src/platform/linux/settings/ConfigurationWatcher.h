@@ -33,7 +33,7 @@ public:
 
     // Which changes of files a watch reports.
     enum class Changes : std::uint8_t {
-        All, // calls without a name also if changes merely cannot be excluded
+        All, // every possible change; a call without a name may be a false alarm
         Writes // a file was written and closed, put in place or touched, even with the same content
     };
 

@@ -34,8 +34,8 @@ class AnalyticsStore final : public Analytics {
 public:
     using WhenKept = std::move_only_function<void()>;
 
-    // How much may wait for the store's thread while it writes as much again. More would not make commits cheaper, and
-    // the payloads would leave the processor's caches before they are written.
+    // The most that may wait for the store's thread; the batch that it is writing may be as large again. More would not
+    // make commits cheaper, and the payloads would leave the processor's caches before they are written.
     struct Limits {
         std::size_t mostEvents = 4096;
         std::size_t mostBytes = 4 * 1024 * 1024;

@@ -13,7 +13,9 @@
 
 namespace platform {
 
-// One thread, except for the counts. The keeper logs and counts its own failures.
+// The store's thread calls its functions; any thread reads the counts. The keeper is made on the thread that makes the
+// store, before the first call, and destroyed on the thread that destroys the store, after the last. It logs and counts
+// its own failures.
 class EventKeeper {
 public:
     EventKeeper() = default;
@@ -21,12 +23,14 @@ public:
     EventKeeper(const EventKeeper&) = delete;
     EventKeeper& operator=(const EventKeeper&) = delete;
 
-    // For how long and how safely events are kept, and how many. Called first, and after every change.
+    // For how long and how safely events are kept, and how many. Called before `open`, and after every change.
     virtual void setConfiguration(const AnalyticsConfiguration& configuration) = 0;
-    // Makes the place for events. Called before the first event.
+    // Opens the place for events, or makes it. Called once, before the first `keep`. If it fails, the keeper logs this,
+    // and the store goes on as if it had not: `keep` tries again, and counts the events as lost while that fails.
     virtual void open() = 0;
     // Keeps all the events, in their order, or none. When it returns, they are kept or counted as lost. A payload that
-    // JSON cannot express is lost alone.
+    // JSON cannot express is lost alone. The batch may be empty: when the store is quiet, when a configuration changed,
+    // and when only callers wait.
     virtual void keep(EventBatch& events) = 0;
     // Whether some tidying waits until the store is quiet.
     [[nodiscard]] virtual bool awaitsQuiet() const = 0;
