@@ -1,3 +1,6 @@
+// The room of the interface: the functions of the public headers, on top of the classes of the other rooms. It adds
+// only checks of what callers pass.
+//
 // Implements kesto.h with the classes of the library: checks for null pointers, and lets no exception out.
 #include "kesto/kesto.h"
 

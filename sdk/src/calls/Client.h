@@ -1,3 +1,6 @@
+// The room of calls: from a caller's function to a sent frame, and from an answer to the caller's callback. It has one
+// thread for each client.
+//
 // The object behind a caller's client: it refuses what cannot be sent, puts the rest into the mailbox, and owns the
 // thread that empties the mailbox.
 #pragma once

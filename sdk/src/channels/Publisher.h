@@ -1,3 +1,6 @@
+// The room of channels: the values that a program publishes, and their files. It writes below the root of channels,
+// with one thread for each publisher, and uses no connection.
+//
 // The owner of channels: writes their files, on a thread of its own and on request, and removes them.
 //
 // The thread sleeps until the first change, writes the changed channels, and rests: so a file is written at most once

@@ -1,3 +1,6 @@
+// The room of the wire: the service's path, the socket, and the frames that it carries. It has no threads and does not
+// know which calls wait for answers.
+//
 // The socket to the service: it connects and carries frames in both directions, and never waits for the peer.
 #pragma once
 

@@ -1,3 +1,5 @@
+// The room of CBOR: values as bytes and bytes as values. It reads from memory, and knows of no connection.
+//
 // Values as CBOR (RFC 8949): the format of the wire, and the compact form in which a session keeps its messages.
 //
 // The reader is the project's own, because the same few lines decode a frame from a hostile client, remember the keys

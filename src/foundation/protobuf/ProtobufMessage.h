@@ -1,3 +1,5 @@
+// The room of protocol buffers: reading, writing and showing their records. It reads from memory, and opens no file.
+//
 // The operations of every protocol-buffers record: reading, writing and formatting.
 #pragma once
 

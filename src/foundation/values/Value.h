@@ -1,3 +1,6 @@
+// The room of values: numbers, texts, arrays and dictionaries, how they compare, and their JSON text. It uses no other
+// room.
+//
 // The one data type of messages, configurations and preferences: null, number, string, array,
 // dictionary, and the data and dates that property lists have.
 //

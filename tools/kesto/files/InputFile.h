@@ -1,3 +1,6 @@
+// The room of files: reading the files that commands show, and writing those that they make. It does not know what the
+// files mean.
+//
 // The files that commands show.
 #pragma once
 

@@ -1,3 +1,6 @@
+// The room of results: the commands that show what the service wrote or what drivers publish. They change nothing of
+// it.
+//
 // The service's event store, for reading: strictly read-only, beside the service while it writes.
 //
 // SQLite shares the write-ahead log through files of its own, which even a reader makes if they are missing; it needs

@@ -1,3 +1,6 @@
+// The room of settings: the commands that change preferences and post notifications. It writes to the configuration
+// directory and to the folder of notifications. The service watches both.
+//
 // One domain's preferences, for changing: preferences/<domain>.toml in the configuration directory, in the form in
 // which the service reads it. A change is made in one step and under a lock, so that two programs can change different
 // keys at the same time.

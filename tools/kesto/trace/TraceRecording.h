@@ -1,3 +1,6 @@
+// The room of traces: recording a program and showing the results. It starts the program, and uses the service through
+// libkesto.
+//
 // Runs a program while a trace measures it: one step in place of a session, a parameters file and a results file that
 // an engineer would handle one by one.
 #pragma once
