@@ -1,6 +1,6 @@
 // The room of connections: the socket of the service, its clients' connections, and the frames that they exchange. It
-// uses sockets and epoll. It hands calls to a queue, and the trace's marker and switch page to clients that ask. It does
-// not know what a call means or what the service does with it.
+// uses sockets and epoll. It hands calls to a queue, and the trace's marker and switch page to clients that ask. It
+// does not know what a call means or what the service does with it.
 //
 // The listener accepts the connections of the service's socket. The thread that resumes it is the connection thread of
 // all of them: it waits for all sockets together, and wakes for nothing else.
