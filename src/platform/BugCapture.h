@@ -44,6 +44,10 @@ public:
 
     // The process that sent the message which the calling thread is handling, or 0. Several processes may share a name;
     // a snapshot that is requested meanwhile is of this process.
+    //
+    // It belongs to the thread because `handleEventForVorp` and `requestSnapshot`, through which a message reaches the
+    // service, have fixed parameters, and the sender is not among them. It is set and read within one work item, and
+    // that runs on one thread.
     [[nodiscard]] static std::int32_t currentSender() noexcept { return currentSender_; }
 
     // Makes a process the current sender of this thread while its message is being handled.

@@ -39,6 +39,9 @@ public:
     virtual ~Connection() = default;
 
     // The connection from which the calling thread is handling a call, or null; null also in the handlers of its end.
+    //
+    // It belongs to the thread because the functions that handle calls have fixed parameters, and the caller is not
+    // among them. Ask before the call's work is submitted to a queue: the queue's items may run on other threads.
     [[nodiscard]] static const Connection* current() noexcept { return current_; }
 
     // Makes a connection the current one of this thread while its calls are being handled.
