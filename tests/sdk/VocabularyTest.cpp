@@ -80,7 +80,7 @@ TEST(Vocabulary, EventTypesAreTheServices)
 TEST(Vocabulary, OperationsAreTheServices)
 {
     using kesto::Operation;
-    constexpr std::array<std::pair<Operation, std::string_view>, 11> names{
+    constexpr auto names = std::to_array<std::pair<Operation, std::string_view>>(
         {{Operation::CreateSession, "createReportingSession"},
          {Operation::SetServiceType, "setServiceType"},
          {Operation::GetServiceType, "getServiceNameForReporterID"},
@@ -91,7 +91,8 @@ TEST(Vocabulary, OperationsAreTheServices)
          {Operation::DestroySession, "destroyReportingSession"},
          {Operation::Validate, "reporterID"},
          {Operation::GetAllReporters, "getAllReporters"},
-         {Operation::KillService, "killService"}}};
+         {Operation::KillService, "killService"}});
+    static_assert(names.size() == client::serviceOperations.size());
     for (const auto& [operation, name] : names)
         EXPECT_EQ(client::serviceOperationNumbered(static_cast<std::int64_t>(operation))->name(), name);
 }

@@ -5,6 +5,7 @@
 #include "client/ServiceOperations.h"
 #include "kesto/MessageKindNames.h"
 
+#include <algorithm>
 #include <array>
 #include <fmt/format.h>
 #include <rapidjson/document.h>
@@ -26,41 +27,43 @@ kesto::Status submitReporter(kesto::Client& client, const ClientCall& call, kest
 }
 
 struct Form {
+    std::string_view operation;
     std::string_view shortName;
     kesto::Status (*submit)(kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered);
 };
 
 // In the order of `client::serviceOperations`.
 constexpr auto forms = std::to_array<Form>({
-    {"create", submitReporter<&kesto::Client::createSession>},
-    {"setServiceType",
+    {"createReportingSession", "create", submitReporter<&kesto::Client::createSession>},
+    {"setServiceType", "setServiceType",
      [](kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered) {
          return client.setServiceType(call.serviceType, call.reporter, std::move(answered));
      }},
-    {"getServiceName", submitReporter<&kesto::Client::getServiceType>},
-    {"setConfiguration",
+    {"getServiceNameForReporterID", "getServiceName", submitReporter<&kesto::Client::getServiceType>},
+    {"setConfiguration", "setConfiguration",
      [](kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered) {
          return client.setConfiguration(call.message, call.reporter, std::move(answered));
      }},
-    {"start", submitReporter<&kesto::Client::startSession>},
-    {"send",
+    {"startReportingSessionForID", "start", submitReporter<&kesto::Client::startSession>},
+    {"sendMessage", "send",
      [](kesto::Client& client, const ClientCall& call, kesto::AnswerCallback answered) {
          const auto to = call.reporters ? kesto::Reporters(*call.reporters) : kesto::Reporters::allStarted();
          return client.send(call.message, call.category, call.type, to, std::move(answered));
      }},
-    {"stop", submitReporter<&kesto::Client::stopSession>},
-    {"destroy", submitReporter<&kesto::Client::destroySession>},
-    {"validate", submitReporter<&kesto::Client::validate>},
-    {"getAllReporters",
+    {"stopReportingSessionForID", "stop", submitReporter<&kesto::Client::stopSession>},
+    {"destroyReportingSession", "destroy", submitReporter<&kesto::Client::destroySession>},
+    {"reporterID", "validate", submitReporter<&kesto::Client::validate>},
+    {"getAllReporters", "getAllReporters",
      [](kesto::Client& client, const ClientCall&, kesto::AnswerCallback answered) {
          return client.getAllReporters(std::move(answered));
      }},
-    {"kill",
+    {"killService", "kill",
      [](kesto::Client& client, const ClientCall&, kesto::AnswerCallback answered) {
          return client.killService(std::move(answered));
      }},
 });
-static_assert(forms.size() == client::serviceOperations.size());
+static_assert(std::ranges::equal(forms, client::serviceOperations, {}, &Form::operation,
+                                 &client::ServiceOperation::name));
 
 constexpr unsigned deepest = 30; // the most levels that the service accepts inside a call
 
