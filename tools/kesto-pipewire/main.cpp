@@ -10,6 +10,7 @@
 #include "kesto-pipewire/Loop.h"
 #include "kesto-pipewire/Observer.h"
 #include "kesto-pipewire/Reporter.h"
+#include "platform/linux/process/Environment.h"
 
 #include <CLI/CLI.hpp>
 #include <pipewire/pipewire.h>
@@ -18,7 +19,6 @@
 #include <unistd.h>
 
 #include <csignal>
-#include <cstdlib>
 #include <string>
 #include <system_error>
 
@@ -42,7 +42,7 @@ public:
     {
         pw_init(nullptr, nullptr);
         // The program has its own messages, so the library's log is off unless the variable switches it on.
-        if (!std::getenv("PIPEWIRE_DEBUG"))
+        if (platform::environment("PIPEWIRE_DEBUG").empty())
             pw_log_set_level(SPA_LOG_LEVEL_NONE);
     }
     ~Library() { pw_deinit(); }

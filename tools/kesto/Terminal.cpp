@@ -2,6 +2,7 @@
 #include "kesto/Terminal.h"
 
 #include "foundation/values/Json.h"
+#include "platform/linux/process/Environment.h"
 
 #include <algorithm>
 #include <cstdlib>
@@ -59,8 +60,8 @@ std::size_t outputWidth()
     winsize size{};
     if (::isatty(STDOUT_FILENO) != 0 && ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0)
         return size.ws_col;
-    if (const char* columns = std::getenv("COLUMNS"))
-        return std::max<std::size_t>(narrowest, std::strtoul(columns, nullptr, 10));
+    if (const std::string columns = platform::environment("COLUMNS"); !columns.empty())
+        return std::max<std::size_t>(narrowest, std::strtoul(columns.c_str(), nullptr, 10));
     return std::string::npos; // not a terminal: lines are not cut
 }
 

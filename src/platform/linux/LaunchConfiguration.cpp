@@ -1,8 +1,9 @@
 // Every variable is read, even after a problem, and the first problem is kept: so the checks read as a list.
 #include "platform/linux/LaunchConfiguration.h"
 
+#include "platform/linux/process/Environment.h"
+
 #include <cerrno>
-#include <cstdlib>
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <string_view>
@@ -15,17 +16,10 @@ namespace {
 
 namespace fs = std::filesystem;
 
-// An empty variable counts as not set, as in a unit file that resets a setting.
-std::string_view variable(const char* name)
-{
-    const char* value = std::getenv(name);
-    return value == nullptr ? std::string_view() : value;
-}
-
 // The first of the directories that the variable names; systemd passes all of a unit's directories.
 fs::path directoryIn(const char* name)
 {
-    const std::string_view value = variable(name);
+    const std::string value = environment(name);
     return value.empty() ? fs::path() : fs::absolute(value.substr(0, value.find(':')));
 }
 
@@ -73,7 +67,7 @@ public:
 
     fs::path socketPath(const char* name, const fs::path& runtimeDirectory)
     {
-        const std::string_view serviceName = variable(name);
+        const std::string serviceName = environment(name);
         fs::path path = runtimeDirectory / serviceName;
         if (serviceName.empty())
             fail("{} is not set: set it to the name of the socket in the runtime directory, or pass a socket", name);
@@ -88,7 +82,7 @@ public:
 
     LogThresholds logThresholds(const char* name)
     {
-        auto thresholds = LogThresholds::parse(variable(name));
+        auto thresholds = LogThresholds::parse(environment(name));
         if (thresholds)
             return std::move(*thresholds);
         fail("{}: {}", name, thresholds.error());
@@ -125,7 +119,7 @@ std::expected<LaunchConfiguration, std::string> LaunchConfiguration::fromEnviron
     configuration.configurationDirectory = reader.directory("CONFIGURATION_DIRECTORY", "the configuration");
     configuration.logThresholds = reader.logThresholds("KESTO_LOG");
 
-    if (const std::string_view channelRoot = variable("KESTO_CHANNEL_ROOT"); !channelRoot.empty())
+    if (const std::string channelRoot = environment("KESTO_CHANNEL_ROOT"); !channelRoot.empty())
         configuration.channelRoot = fs::absolute(channelRoot);
     else if (!configuration.runtimeDirectory.empty())
         configuration.channelRoot = configuration.runtimeDirectory / "channels";

@@ -4,10 +4,10 @@
 #include "foundation/values/String.h"
 #include "platform/linux/files/WriteAll.h"
 #include "platform/linux/log/ProviderLog.h"
+#include "platform/linux/process/Environment.h"
 #include "platform/linux/process/LinuxClock.h"
 
 #include <cerrno>
-#include <cstdlib>
 #include <cstring>
 #include <fmt/format.h>
 #include <iterator>
@@ -76,10 +76,9 @@ void appendLine(const LogRecord& record, Buffer& out)
 
 LinuxLog::Destination LinuxLog::destinationOfThisProcess()
 {
-    const char* stream = std::getenv("JOURNAL_STREAM");
     struct stat status = {};
-    if (stream == nullptr || ::fstat(STDERR_FILENO, &status) != 0
-        || stream != fmt::format("{}:{}", status.st_dev, status.st_ino))
+    if (::fstat(STDERR_FILENO, &status) != 0
+        || environment("JOURNAL_STREAM") != fmt::format("{}:{}", status.st_dev, status.st_ino))
         return {};
     return {.journalSocket = "/run/systemd/journal/socket"};
 }

@@ -125,6 +125,8 @@ TEST_F(EventsCommand, CutsTheTableToTheWidthOfTheTerminalBetweenCharacters)
     EXPECT_THAT(tool.print({"events"}), EndsWith(" a=äöüäöüäöüäöüäöü…\n"));
     tool.setVariable("COLUMNS=1");
     EXPECT_THAT(tool.print({"events"}), EndsWith(" a=äöüäö…\n")) << "something always";
+    tool.setVariable("COLUMNS=");
+    EXPECT_THAT(tool.print({"events"}), EndsWith("äöüäöü\n")) << "an empty variable counts as not set";
 }
 
 TEST_F(EventsCommand, KeepsControlCharactersFromTheTerminal)
