@@ -20,8 +20,7 @@
 #include "platform/linux/queues/LinuxMemory.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/settings/ConfigurationWatcher.h"
-#include "platform/linux/settings/LinuxDeviceProperties.h"
-#include "platform/linux/settings/LinuxFeatureFlags.h"
+#include "platform/linux/settings/LinuxDeviceSettings.h"
 #include "platform/linux/settings/LinuxNotifications.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "platform/linux/store/AnalyticsStore.h"
@@ -51,8 +50,7 @@ private:
     LinuxClock clock_;
     LinuxNotifications notifications_;
     LinuxPreferences preferences_; // posts notifications
-    LinuxFeatureFlags featureFlags_;
-    LinuxDeviceProperties deviceProperties_;
+    LinuxDeviceSettings deviceSettings_;
     LinuxProcessTable processTable_;
     FolderLimits folderLimits_;
     LinuxFileSystem fileSystem_;

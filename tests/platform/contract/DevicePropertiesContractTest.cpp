@@ -1,6 +1,6 @@
 // The contract of platform/DeviceProperties.h: a property is true, false, or missing.
 #include "platform/contract/Contract.h"
-#include "platform/linux/settings/LinuxDeviceProperties.h"
+#include "platform/linux/settings/LinuxDeviceSettings.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
 #include "support/fakes/FakeSettings.h"
@@ -37,7 +37,7 @@ private:
     const support::TemporaryDirectory directory_;
     support::FakeLog log_;
     platform::ConfigurationWatcher watcher_{directory_.path(), platform::ProviderLog(log_)};
-    platform::LinuxDeviceProperties properties_{watcher_, platform::ProviderLog(log_)};
+    platform::LinuxDeviceSettings properties_{watcher_, platform::ProviderLog(log_)};
 };
 
 using DevicePropertiesContract = Suite<DevicePropertiesSubject>;

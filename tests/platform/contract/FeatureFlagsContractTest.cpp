@@ -1,6 +1,6 @@
 // The contract of platform/FeatureFlags.h: a flag is on only if its owner has switched it on.
 #include "platform/contract/Contract.h"
-#include "platform/linux/settings/LinuxFeatureFlags.h"
+#include "platform/linux/settings/LinuxDeviceSettings.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
 #include "support/fakes/FakeSettings.h"
@@ -44,7 +44,7 @@ private:
     const support::TemporaryDirectory directory_;
     support::FakeLog log_;
     platform::ConfigurationWatcher watcher_{directory_.path(), platform::ProviderLog(log_)};
-    platform::LinuxFeatureFlags flags_{watcher_, platform::ProviderLog(log_)};
+    platform::LinuxDeviceSettings flags_{watcher_, platform::ProviderLog(log_)};
 };
 
 using FeatureFlagsContract = Suite<FeatureFlagsSubject>;

@@ -2,8 +2,7 @@
 // and the watcher that notices the changes.
 #include "platform/linux/settings/LinuxPreferences.h"
 
-#include "platform/linux/settings/LinuxDeviceProperties.h"
-#include "platform/linux/settings/LinuxFeatureFlags.h"
+#include "platform/linux/settings/LinuxDeviceSettings.h"
 #include "support/PrintValues.h"
 #include "support/ProcessThreads.h"
 #include "support/Sanitizers.h"
@@ -315,8 +314,7 @@ TEST_F(LinuxPreferencesTest, AllOfTheConfigurationSharesOneThread)
 {
     makePreferences();
     const std::size_t before = support::threadsOfTheProcess();
-    const LinuxFeatureFlags flags(*watcher, ProviderLog(log));
-    const LinuxDeviceProperties properties(*watcher, ProviderLog(log));
+    const LinuxDeviceSettings settings(*watcher, ProviderLog(log));
     EXPECT_EQ(support::threadsOfTheProcess(), before);
 }
 
@@ -377,7 +375,7 @@ protected:
 
 TEST_F(LinuxSettingsTest, AFlagThatIsNotSetIsOff)
 {
-    const LinuxFeatureFlags flags(watcher, ProviderLog(log));
+    const LinuxDeviceSettings flags(watcher, ProviderLog(log));
     EXPECT_FALSE(flags.isEnabled("Sonalis", "Tracing"));
     support::writeFile(directory.path() / "feature-flags.toml", "Sonalis = true\n[Other]\nTracing = true\n");
     EXPECT_TRUE(becomesTrue([&] { return flags.isEnabled("Other", "Tracing"); }));
@@ -388,7 +386,7 @@ TEST_F(LinuxSettingsTest, AFlagThatIsNotSetIsOff)
 TEST_F(LinuxSettingsTest, AFlagIsSetInTheTableOfItsDomain)
 {
     support::writeFile(directory.path() / "feature-flags.toml", "[Sonalis]\nTracing = true\nOff = false\n");
-    const LinuxFeatureFlags flags(watcher, ProviderLog(log));
+    const LinuxDeviceSettings flags(watcher, ProviderLog(log));
     EXPECT_TRUE(flags.isEnabled("Sonalis", "Tracing"));
     EXPECT_FALSE(flags.isEnabled("Sonalis", "Off"));
     support::replaceFile(directory.path() / "feature-flags.toml", "[Sonalis]\nTracing = false\n");
@@ -398,7 +396,7 @@ TEST_F(LinuxSettingsTest, AFlagIsSetInTheTableOfItsDomain)
 TEST_F(LinuxSettingsTest, APropertyIsTrueFalseOrNotThere)
 {
     support::writeFile(directory.path() / "device.toml", "InternalBuild = true\nOther = false\n");
-    const LinuxDeviceProperties properties(watcher, ProviderLog(log));
+    const LinuxDeviceSettings properties(watcher, ProviderLog(log));
     EXPECT_EQ(properties.boolean("InternalBuild"), true);
     EXPECT_EQ(properties.boolean("Other"), false);
     EXPECT_EQ(properties.boolean("Missing"), std::nullopt);
@@ -407,7 +405,7 @@ TEST_F(LinuxSettingsTest, APropertyIsTrueFalseOrNotThere)
 TEST_F(LinuxSettingsTest, ABrokenPropertyFileIsComplainedAboutAndCountsAgainOnceRepaired)
 {
     support::writeFile(directory.path() / "device.toml", "InternalBuild = ja\n");
-    const LinuxDeviceProperties properties(watcher, ProviderLog(log));
+    const LinuxDeviceSettings properties(watcher, ProviderLog(log));
     EXPECT_EQ(properties.boolean("InternalBuild"), std::nullopt);
     EXPECT_THAT(log.take(),
                 ElementsAre(testing::Field(&support::LogLine::message,
