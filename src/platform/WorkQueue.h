@@ -10,8 +10,8 @@
 // Threads: items belong to their queue, not to a thread. If a queue may be helped, its items run on its own thread or
 // on a thread that submitted some and offers its help; that thread then also runs items of other submitters. So nothing
 // that an item needs may be thread-local. A thread that helps must hold no lock while it submits to such a queue or
-// when it would sleep, because an item that takes the same lock might run on that very thread. Debug builds end the
-// process if it holds one.
+// when it helps, because an item that takes the same lock might run on that very thread. Debug builds end the process
+// if it holds a `foundation::Lock`; other locks are not counted.
 //
 // No queue polls. An empty queue has a sleeping thread, or none.
 #pragma once

@@ -200,6 +200,7 @@ SerialQueue::Helper::~Helper()
 
 void SerialQueue::Helper::help()
 {
+    assert(!foundation::Lock::isAnyHeld());
     if (const auto work = std::exchange(Work::thisThread.toHelp, nullptr))
         work->help();
 }

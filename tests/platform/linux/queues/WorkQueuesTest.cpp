@@ -408,6 +408,19 @@ TEST_F(WorkQueuesTest, AThreadThatHelpsHoldsNoLockWhileItSubmits)
         "isAnyHeld");
 }
 
+TEST_F(WorkQueuesTest, AThreadThatHelpsHoldsNoLockWhenItWouldSleep)
+{
+    GTEST_FLAG_SET(death_test_style, "threadsafe");
+    foundation::Mutex mutex;
+    EXPECT_DEBUG_DEATH(
+        {
+            SerialQueue::Helper helper;
+            const foundation::Lock lock(mutex);
+            helper.help(); // even though there is nothing to help with
+        },
+        "isAnyHeld");
+}
+
 TEST_F(WorkQueuesTest, AQueueThatGoesRunsWhatWasSubmittedBefore)
 {
     int ran = 0;
