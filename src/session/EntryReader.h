@@ -8,15 +8,13 @@
 // from which it derived something, and asks `isSameAs` whether it has to derive it again.
 #pragma once
 
-#include "foundation/cbor/Cbor.h"
 #include "foundation/cbor/CborView.h"
 #include "session/MessageStore.h"
 
 #include <algorithm>
 #include <array>
+#include <cassert>
 #include <cstdint>
-#include <deque>
-#include <string>
 #include <string_view>
 #include <vector>
 
@@ -26,12 +24,13 @@ namespace session {
 template <typename Note> class EntryReader {
 public:
     // Calls `visit(note, item)` for each entry, in order. Calls `learn(key)` for the note unless the previous payload
-    // gave it. The items are valid as long as the entry reader exists and the store records nothing.
+    // gave it. The payload must be encoded. The items are valid as long as the store records nothing.
     template <typename Learn, typename Visit>
     void read(std::uint32_t kind, const MessageStore::Payload& payload, Learn learn, Visit visit)
     {
+        assert(payload.kept() == nullptr);
         auto& places = places_[kind % places_.size()];
-        std::string_view rest = foundation::CborItem(encoded(payload)).content();
+        std::string_view rest = foundation::CborItem(payload.encoded()).content();
         for (std::size_t index = 0; !rest.empty(); ++index) {
             if (index == places.size() && index < mostPlaces)
                 places.emplace_back();
@@ -65,15 +64,6 @@ private:
     static constexpr std::size_t mostKinds = 8;
     static constexpr std::size_t mostPlaces = 64;
 
-    std::string_view encoded(const MessageStore::Payload& payload)
-    {
-        if (payload.kept() == nullptr)
-            return payload.encoded();
-        foundation::appendCbor(*payload.kept(), encodedHere_.emplace_back());
-        return encodedHere_.back();
-    }
-
-    std::deque<std::string> encodedHere_; // payloads that the store keeps unencoded
     std::array<std::vector<Place>, mostKinds> places_;
 };
 

@@ -189,10 +189,13 @@ void KestoReportingSession::sendVolumeEvents(platform::Turn& turn)
     if (volumeEvents.empty())
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Default, "sending volume event for reporter {}", reporterID_);
-    const std::size_t paidForEach = share.bytes() / volumeEvents.size();
+    std::size_t roughBytes = 0;
+    for (const auto& event : volumeEvents)
+        roughBytes += event.roughBytes();
+    const double paidForAByte = static_cast<double>(share.bytes()) / static_cast<double>(roughBytes);
     for (auto& next : volumeEvents) {
         const auto volumeEvent = std::exchange(next, {}); // freed as soon as the store has it
-        share.shrink(paidForEach);
+        share.shrink(static_cast<std::size_t>(static_cast<double>(volumeEvent.roughBytes()) * paidForAByte));
         sendMessage(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
         KestoReportingFennicBridge::handleEvent(turn, volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,
                                                 shared_from_this());
@@ -205,5 +208,9 @@ void KestoReportingSession::sendSummaryEvent()
     if (!summary)
         return;
     KESTO_LOG(KestoReportingSessionCategory(), Default, "sending summary event for reporter {}", reporterID_);
+    {
+        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
+        nestedAggregatedPayloadData_->keepLargePayloadsAsTheyCome(); // no analysis reads them any more
+    }
     sendMessage(summary, AudioEventCategoryUndefined, AudioEventTypeUnknown, true, nullptr);
 }

@@ -19,8 +19,7 @@ constexpr std::size_t largestChunk = std::size_t{256} << 10;
 // A larger last payload is decoded again for each comparison: decoded, it would take many times its bytes.
 constexpr std::size_t largestKeptDecoded = 1024;
 
-// Larger payloads are kept unencoded: only payloads that a session derives itself grow so large, and a second copy
-// would waste memory.
+// Of the payloads that may be kept as they come, only larger ones are.
 constexpr std::size_t largestEncoded = std::size_t{1} << 20;
 
 // Stamps that a client may add to any message. They give its time, and nothing about its content.
@@ -115,7 +114,7 @@ std::optional<std::uint32_t> MessageStore::kindNamedLike(AudioEventCategory cate
 bool MessageStore::append(std::uint32_t kind, const foundation::Dictionary& payload, std::size_t bytes,
                           Payload& appended)
 {
-    const bool isLarge = bytes > largestEncoded && textSize(payload) > largestEncoded;
+    const bool isLarge = keepsLargeAside_ && bytes > largestEncoded && textSize(payload) > largestEncoded;
     if (isLarge && !share_.grow(bytes))
         return false;
     const std::size_t size = isLarge ? 0 : foundation::cborSize(payload);

@@ -44,7 +44,7 @@ public:
     public:
         [[nodiscard]] foundation::Dictionary dictionary() const;
 
-        // One of the two is set: the encoding, or a large payload as it came (see `EntryReader`).
+        // One of the two is set: the encoding, or a large payload as it came (`keepLargePayloadsAsTheyCome`).
         [[nodiscard]] std::string_view encoded() const noexcept { return encoded_; }
         [[nodiscard]] const foundation::Dictionary* kept() const noexcept { return kept_; }
 
@@ -68,6 +68,11 @@ public:
     // Records the payload unless it equals the last accepted one of its kind except for time stamps. Errors (by
     // category or type) are recorded in any case.
     Outcome record(AudioEventCategory category, AudioEventType type, const foundation::Dictionary& payload);
+
+    // From now on large payloads are kept as they come, without an encoding. Call it before a session's summary, the
+    // last message of its run: the summary may be so large that its encoding would double the memory of the run.
+    // `EntryReader` does not read such payloads.
+    void keepLargePayloadsAsTheyCome() noexcept { keepsLargeAside_ = true; }
 
     [[nodiscard]] std::size_t size() const noexcept { return size_; }
     [[nodiscard]] bool empty() const noexcept { return size_ == 0; }
@@ -137,6 +142,7 @@ private:
     StorageShare share_;
     std::vector<Chunk> chunks_;
     std::deque<foundation::Dictionary> keptAside_;
+    bool keepsLargeAside_ = false;
     std::vector<Kind> kinds_;
     std::unordered_map<std::string, std::uint32_t> kindByKey_;
     std::optional<Recent> recent_; // the kind of the previous message

@@ -1,6 +1,7 @@
 // Which entries the reader gives, and that an unchanged entry is the same item as before.
 #include "session/EntryReader.h"
 
+#include "session/AllocatedBytes.h"
 #include "session/GeneratedMessages.h"
 #include "session/StoredMessages.h"
 
@@ -92,11 +93,14 @@ TEST(EntryReader, ComparesWithThePayloadOfTheSameKind)
     EXPECT_THAT(reading.learnt(), ElementsAre("a", "b"));
 }
 
-TEST(EntryReader, ReadsAPayloadThatTheStoreKeepsUnencoded)
+TEST(EntryReader, ReadsLargePayloadsWithoutACopy)
 {
     const std::string large(std::size_t{2} << 20, 'x');
     const auto store = storeOf({{{"a", large}, {"b", 1}}, {{"a", 2}, {"b", 1}}});
+    const auto before = allocatedBytes();
+    forgetMostAllocatedBytes();
     const Reading reading(*store);
+    EXPECT_LT(mostAllocatedBytes() - before, std::ptrdiff_t{1} << 20);
     EXPECT_EQ(reading.payloads()[0][0].item.stringView(), large);
     EXPECT_THAT(reading.payloads()[1], testing::SizeIs(2));
     EXPECT_EQ(reading.payloads()[1][0].item.number()->int64Value(), 2);

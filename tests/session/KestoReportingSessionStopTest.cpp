@@ -1,8 +1,11 @@
 // The end of a run, step by step: volume events, file, summary event.
+#include "session/AllocatedBytes.h"
 #include "session/KestoReportingSession.h"
 #include "session/StoredMessages.h"
+#include "support/Sanitizers.h"
 #include "support/TestPlatform.h"
 
+#include <algorithm>
 #include <gmock/gmock.h>
 
 namespace {
@@ -323,6 +326,97 @@ TEST_F(CustomerSessionStop, MeasuresNothingAndWritesNoFileButRecordsTheSummary)
     const std::string skipped = "skipped volume message, too short { func=+[KestoReportingSession "
                                 "createVolumeMessages:process:minimumPlaytime:], action=skip, count=0 }";
     EXPECT_THAT(platform.log.lines("keri"), Contains(IsLine(Debug, "keri", skipped)).Times(2));
+}
+
+// A session whose messages, and so its volume events, have large texts, none of which share memory.
+class LargeSessionStop : public SessionStop {
+protected:
+    static constexpr std::size_t sizeOfText = 600'000;
+    static constexpr int largeMessages = 31;
+    static constexpr std::size_t bytesOfTexts = largeMessages * 2 * sizeOfText;
+
+    // The summary file is not kept: it would take memory, too.
+    void begin(std::size_t limit)
+    {
+        platform.fileSystem.createError = std::make_error_code(std::errc::no_space_on_device);
+        platform.log.setThreshold(Error);
+        before_ = allocatedBytes();
+        forgetMostAllocatedBytes();
+        budget = std::make_shared<session::StorageBudget>(limit);
+        session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
+        session->setServiceType(7);
+        session->setConfiguration(Dictionary{{"HostApplicationDisplayID", "org.player"}});
+        session->start();
+    }
+    // A message that begins a volume event of 1000 seconds; the large ones have texts.
+    void sendSmall()
+    {
+        ++sent_;
+        send(sent_ * 1000.0, {{"session_output_running", true}, {"PomoSessionVolume", sent_ % 2}});
+    }
+    void sendLarge()
+    {
+        ++sent_;
+        const auto letter = static_cast<char>(' ' + sent_ % 64);
+        send(sent_ * 1000.0,
+             {{"session_output_running", true},
+              {"PomoSessionVolume", 0.5},
+              {"session_selected_format", std::string(sizeOfText, letter)},
+              {"active_devices", std::string(sizeOfText, letter)}});
+    }
+    void sendEnd() { send(++sent_ * 1000.0, {{"session_output_running", false}}); }
+    [[nodiscard]] std::ptrdiff_t allocated() const { return allocatedBytes() - before_; }
+    [[nodiscard]] std::ptrdiff_t mostAllocated() const { return mostAllocatedBytes() - before_; }
+
+    std::shared_ptr<session::StorageBudget> budget;
+
+private:
+    int sent_ = 0;
+    std::ptrdiff_t before_ = 0;
+};
+
+// The summary's texts double as they grow. Each ends with nearly 64 of the messages' texts, so with little room to
+// spare.
+TEST_F(LargeSessionStop, TakesNoMoreMemoryThanTheBudgetHas)
+{
+    KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
+    constexpr std::size_t taken = 4 * bytesOfTexts; // messages, events, and the summary of both
+    constexpr std::size_t limit = taken + taken / 20;
+    begin(limit);
+    for (int number = 0; number < largeMessages; ++number)
+        sendLarge();
+    sendEnd();
+    std::size_t recorded = 0;
+    platform.traceEmitter.setObserver([&](std::uint32_t code) {
+        recorded += code == accepted ? 1 : 0;
+        platform.analytics.clear(); // the events that it keeps here take memory, too
+    });
+    session->stop(platform.turn);
+    platform.traceEmitter.setObserver(nullptr);
+    EXPECT_EQ(recorded, 32U) << "volume events and the summary";
+    EXPECT_THAT(platform.log.lines(), Not(Contains(testing::Field(&support::LogLine::message, HasSubstr("lost")))));
+    EXPECT_LE(mostAllocated(), static_cast<std::ptrdiff_t>(limit));
+}
+
+TEST_F(LargeSessionStop, GoesOnPayingForTheVolumeEventsThatItHasNotRecordedYet)
+{
+    KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
+    begin(std::size_t{1} << 30);
+    for (int number = 0; number < 400; ++number)
+        sendSmall();
+    for (int number = 0; number < largeMessages; ++number)
+        sendLarge();
+    sendEnd();
+    std::ptrdiff_t mostUnpaid = 0;
+    platform.traceEmitter.setObserver([&](std::uint32_t code) {
+        platform.analytics.clear();
+        if (code == accepted)
+            mostUnpaid = std::max(mostUnpaid, allocated() - static_cast<std::ptrdiff_t>(budget->taken()));
+    });
+    session->stop(platform.turn);
+    platform.traceEmitter.setObserver(nullptr);
+    constexpr std::ptrdiff_t eventBeingRecorded = 2 * sizeOfText;
+    EXPECT_LT(mostUnpaid, 2 * eventBeingRecorded);
 }
 
 } // namespace

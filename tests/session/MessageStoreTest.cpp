@@ -304,10 +304,22 @@ TEST(MessageStore, GoesOnComparingWithWhatItRecordedLastWhenItIsFull)
     EXPECT_EQ(store.counts(), (Dictionary{{"Playback_Start", 2}}));
 }
 
-TEST(MessageStore, KeepsAPayloadAsItIsThatIsTooLargeToBeEncoded)
+TEST(MessageStore, EncodesLargePayloadsToo)
+{
+    session::MessageStore store(plenty());
+    const Dictionary huge{{"a", std::string(std::size_t{8} << 20, 'x')}};
+    EXPECT_EQ(store.record(4, 1, huge), Outcome::Recorded);
+    EXPECT_EQ(store.record(4, 1, huge), Outcome::Redundant);
+    EXPECT_THAT(entries(store), ElementsAre(Pair("Playback_Start_1", huge)));
+    store.forEach(
+        [&](const auto& message) { EXPECT_EQ(message.payload.encoded().size(), foundation::cborSize(huge)); });
+}
+
+TEST(MessageStore, KeepsLargePayloadsAsTheyComeOnRequest)
 {
     const auto budget = plenty();
     session::MessageStore store(budget);
+    store.keepLargePayloadsAsTheyCome();
     const Dictionary huge{{"a", std::string((1 << 20) + 1, 'x')}};
     EXPECT_EQ(store.record(4, 1, {{"a", 1}}), Outcome::Recorded);
     EXPECT_EQ(store.record(4, 1, huge), Outcome::Recorded);
@@ -326,6 +338,7 @@ TEST(MessageStore, PaysNothingForALargePayloadThatItCannotKeep)
     const auto budget = std::make_shared<session::StorageBudget>(size + 500);
     {
         session::MessageStore store(budget);
+        store.keepLargePayloadsAsTheyCome();
         EXPECT_EQ(store.record(4, 1, {{"a", std::string(size - 1, 'x')}}), Outcome::Full);
         EXPECT_LT(budget->taken(), 500U) << "only its kind is paid for";
     }
