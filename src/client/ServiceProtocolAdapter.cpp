@@ -76,26 +76,33 @@ public:
     {
     }
 
-    template <std::integral Integer> void take(Integer& integer)
+    template <typename Parameter> void take(Parameter& parameter)
+    {
+        read(parameter);
+        ++taken_;
+    }
+
+    [[nodiscard]] const std::optional<std::string>& refusal() const { return refusal_; }
+
+private:
+    template <std::integral Integer> void read(Integer& integer)
     {
         const auto exact = value().exactly<Integer>();
         if (!exact)
             refuse(foundation::format("an integer from {} to {}", std::numeric_limits<Integer>::min(),
                                       std::numeric_limits<Integer>::max()));
         integer = exact.value_or(0);
-        ++taken_;
     }
 
-    void take(Dictionary& dictionary)
+    void read(Dictionary& dictionary)
     {
         auto given = value().dictionary();
         if (!given)
             refuse("a map");
         dictionary = std::move(given).value_or(Dictionary());
-        ++taken_;
     }
 
-    void take(std::optional<ReporterIDs>& reporterIDs)
+    void read(std::optional<ReporterIDs>& reporterIDs)
     {
         constexpr std::size_t most = mostReportersOfAMessage;
         const auto array = value().array();
@@ -105,18 +112,14 @@ public:
             refuse(foundation::format("an array of at most {} elements", most));
         if (array && !refusal_)
             reporterIDs = integers(*array);
-        ++taken_;
     }
 
     template <typename... Results>
-    void take(std::function<void(platform::Turn&, const std::optional<utility::ReplyError>&, Results...)>& reply)
+    void read(std::function<void(platform::Turn&, const std::optional<utility::ReplyError>&, Results...)>& reply)
     {
         reply = std::move(reply_);
     }
 
-    [[nodiscard]] const std::optional<std::string>& refusal() const { return refusal_; }
-
-private:
     ReporterIDs integers(const Array& array)
     {
         ReporterIDs integers;

@@ -745,13 +745,14 @@ TEST_F(ClientServerInstanceTest, ListsTheReportersOfAllClientsInOrder)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
-TEST_F(ClientServerInstanceTest, ListsNothingForWhoIsGone)
+// The connection still takes answers here; a closed one would drop the list, and the work for it would not show.
+TEST_F(ClientServerInstanceTest, MakesNoListsForCallsThatWaitWhenTheirConnectionIsLost)
 {
     create(42);
     const auto call = player.submit(GetAllReporters, {});
-    player.connection().close();
+    player.object()->handleConnectionError();
     platform.workQueues.runAll();
-    EXPECT_THAT(player.answersTo(call), IsEmpty());
+    EXPECT_EQ(player.answersTo(call), unanswered);
     EXPECT_EQ(player.connection().unansweredCalls(), 0U);
     EXPECT_EQ(recorder.call(GetAllReporters), answeredOnce({null, Array{}}));
 }
@@ -777,6 +778,26 @@ TEST_F(ClientServerInstanceTest, DescribesNoMoreSessionsThanALogLineShows)
                     testing::Field("message", &LogLine::message,
                                    testing::AllOf(testing::StartsWith("sessions for client 1001 : [\"reporterID=1,"),
                                                   testing::EndsWith(" more\"]")))));
+}
+
+TEST_F(ClientServerInstanceTest, DescribesOneMoreSessionAfterExactly24KibibytesOfDescriptionsAndNoneAfterMore)
+{
+    constexpr std::size_t sessionsOf24Kibibytes = 96;
+    constexpr std::size_t bytesOfADescription = 256;
+    KestoReportingServiceDelegateProtocol::Sessions sessions;
+    const auto addSession = [&](std::int64_t reporterID) {
+        sessions.push_back(std::make_shared<KestoReportingSession>(reporterID, std::vector<std::int32_t>{1001}));
+        sessions.back()->setConfiguration(Dictionary{{"HostApplicationDisplayID", std::string(173, 'x')}});
+        ASSERT_EQ(sessions.back()->description().size(), bytesOfADescription);
+    };
+    for (std::size_t count = 0; count < sessionsOf24Kibibytes; ++count)
+        addSession(100);
+    addSession(201);
+    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::EndsWith("xxx,started=0\"]"));
+    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::HasSubstr("\"reporterID=201,"));
+    addSession(202);
+    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::HasSubstr("\"reporterID=201,"));
+    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::EndsWith("xxx,started=0\",\"... 1 more\"]"));
 }
 
 // --- kill

@@ -650,4 +650,18 @@ TEST_F(SessionVolumeEvents, AreThereInSmallNumbersEvenWhenTheBudgetIsUsedUp)
     EXPECT_EQ(share.bytes(), 0U);
 }
 
+// 64 KiB are free. Beside its process's name the event takes 296 bytes, and the word "unknown" twice, with 48 bytes for
+// each as an object.
+TEST_F(SessionVolumeEvents, TakeExactlyTheirUnpaidBytesWhenTheBudgetIsUsedUpAndNotOneMore)
+{
+    constexpr std::size_t longestProcess = 65'536 - 296 - 2 * (48 + 7);
+    const auto store = storeOfVolumeChanges(1);
+    const auto eventsOf = [&](std::size_t process) {
+        session::StorageShare share(std::make_shared<session::StorageBudget>(0));
+        return KestoReportingSession::createVolumeMessages(*store, Value(std::string(process, 'x')), 0.5, share);
+    };
+    EXPECT_THAT(eventsOf(longestProcess), SizeIs(1));
+    EXPECT_THAT(eventsOf(longestProcess + 1), IsEmpty());
+}
+
 } // namespace
