@@ -63,6 +63,10 @@ find_package(fmt REQUIRED)
 # kesto_headers: the headers of the standard library and of {fmt} that most sources use, compiled once for all layers.
 # A precompiled header fits only sources with the same options, so a layer adds none of its own. Each source still names
 # what it uses: clang-tidy reads all of them without precompiled headers.
+# With optimization g++ warns of code in precompiled headers of the library as if it were the project's.
+if(NOT CMAKE_BUILD_TYPE STREQUAL Debug)
+  set(CMAKE_DISABLE_PRECOMPILE_HEADERS ON)
+endif()
 set(standard_headers
   <algorithm> <atomic> <chrono> <expected> <filesystem> <functional> <map> <memory> <optional> <span> <string>
   <string_view> <system_error> <thread> <utility> <vector> <fmt/format.h>)
