@@ -23,8 +23,7 @@ add_compile_definitions($<$<CONFIG:Debug>:_GLIBCXX_ASSERTIONS>)
 # deprecated functions, for which only clang warns; g++ itself warns of the project's uses.
 add_compile_options(-Wall -Wextra -Wpedantic -Werror -Wshadow -Wimplicit-fallthrough
                     $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
-                    $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety> $<$<CXX_COMPILER_ID:Clang>:-Wreserved-identifier>
-                    $<$<CXX_COMPILER_ID:Clang>:-Wno-deprecated-declarations>)
+                    $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety> $<$<CXX_COMPILER_ID:Clang>:-Wno-deprecated-declarations>)
 
 # A program is linked only with those libraries of its layers that it uses.
 add_link_options(-Wl,--as-needed)
