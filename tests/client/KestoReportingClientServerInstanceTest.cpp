@@ -745,6 +745,17 @@ TEST_F(ClientServerInstanceTest, ListsTheReportersOfAllClientsInOrder)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
+TEST_F(ClientServerInstanceTest, ListsNothingForAClientThatHasGone)
+{
+    create(42);
+    const auto call = player.submit(GetAllReporters, {});
+    player.connection().close();
+    platform.workQueues.runAll();
+    EXPECT_THAT(player.answersTo(call), IsEmpty());
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U);
+    EXPECT_EQ(recorder.call(GetAllReporters), answeredOnce({null, Array{}}));
+}
+
 // The connection still takes answers here; a closed one would drop the list, and the work for it would not show.
 TEST_F(ClientServerInstanceTest, MakesNoListsForCallsThatWaitWhenTheirConnectionIsLost)
 {

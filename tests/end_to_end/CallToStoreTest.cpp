@@ -313,10 +313,9 @@ TEST(FeatureRoadTest, APreferenceThatChangesReachesEverySession)
     EXPECT_EQ(kestod.countInLog("feature 2 changes"), 1U);
 }
 
-TEST(CustomerRoadTest, EventsKeepTheTimeStampThatRecordedMessagesLose)
+// A session that plays from the second 10 on.
+void playUntil(double end, const Kestod& kestod)
 {
-    Kestod kestod;
-    kestod.start();
     WireClient client(kestod.socketPath());
     client.ask(Create, 1);
     client.call(Start, 1);
@@ -324,11 +323,18 @@ TEST(CustomerRoadTest, EventsKeepTheTimeStampThatRecordedMessagesLose)
         SendMessage,
         Dictionary{{"session_output_running", true}, {"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 10.0}},
         playback, typeStart, Array{1});
-    client.ask(SendMessage, Dictionary{{"session_output_running", false}, {"kestoreporting_timestamp", 20.0}}, playback,
+    client.ask(SendMessage, Dictionary{{"session_output_running", false}, {"kestoreporting_timestamp", end}}, playback,
                typeStop, Array{1});
     client.call(Stop, 1);
     client.nextReply();
     client.nextReply();
+}
+
+TEST(CustomerRoadTest, EventsKeepTheTimeStampThatRecordedMessagesLose)
+{
+    Kestod kestod;
+    kestod.start();
+    playUntil(20.0, kestod);
     EXPECT_THAT(kestod.events("com.quarn.kesto.Playback.Start"),
                 ElementsAre(Field(&StoreRow::payload, HasSubstr("kestoreporting_timestamp"))));
     EXPECT_THAT(kestod.events("com.quarn.kesto.Volume.Summary"), SizeIs(0)); // every stretch measures 0
@@ -356,18 +362,7 @@ TEST(InternalRoadTest, PlayingBecomesAVolumeEventAndASummaryFile)
 {
     Kestod kestod(Kestod::Files{{"device.toml", "InternalBuild = true\n"}});
     kestod.start();
-    WireClient client(kestod.socketPath());
-    client.ask(Create, 1);
-    client.call(Start, 1);
-    client.ask(
-        SendMessage,
-        Dictionary{{"session_output_running", true}, {"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 10.0}},
-        playback, typeStart, Array{1});
-    client.ask(SendMessage, Dictionary{{"session_output_running", false}, {"kestoreporting_timestamp", 20.6}}, playback,
-               typeStop, Array{1});
-    client.call(Stop, 1);
-    client.nextReply();
-    client.nextReply();
+    playUntil(20.6, kestod);
     EXPECT_THAT(kestod.events("com.quarn.kesto.Volume.Summary"),
                 ElementsAre(Field(&StoreRow::payload, HasSubstr(R"("play_seconds":10.6)"))));
     std::size_t files = 0;

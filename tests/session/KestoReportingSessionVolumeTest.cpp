@@ -155,7 +155,7 @@ TEST_F(SessionVolumeEvents, BucketPlayTimes)
                 ElementsAre("0"));
 }
 
-TEST_F(SessionVolumeEvents, NameTheApplicationWhateverItsType)
+TEST_F(SessionVolumeEvents, NameTheApplicationEvenIfItIsNotText)
 {
     EXPECT_THAT(values(create({startAt(0), stopAt(1)}, Value(7)), "HostApplicationDisplayID"), ElementsAre("7"));
 }

@@ -1,6 +1,6 @@
-// Runners on real queues, with a kernel trace that delivers events on its own thread. Whatever the threads do at the
-// same time, results hold every interval that was delivered before the end. The thread sanitizer checks that no two
-// threads use the same data.
+// Runners on real queues, with a kernel trace that delivers events on its own thread. While the threads work
+// at the same time, the results hold every interval that was delivered before the end. The thread sanitizer checks that
+// no two threads use the same data.
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "support/ExchangedProviders.h"
 #include "support/TestPlatform.h"

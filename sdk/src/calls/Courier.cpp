@@ -142,7 +142,8 @@ bool Courier::canTakeCalls() const noexcept
     return connection_.unsentBytes() < mostUnsentBytes && calls_.unanswered() < settings_.unansweredLimit;
 }
 
-// A call leaves the mailbox only when the table has it: whatever fails in between, the call is answered exactly once.
+// A call leaves the mailbox only when the table has it. So a failure in between loses no call, and the library answers
+// each call exactly once.
 void Courier::takeCalls()
 {
     while (canTakeCalls()) {

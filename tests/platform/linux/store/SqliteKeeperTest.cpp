@@ -447,7 +447,7 @@ TEST_F(SqliteKeeperTest, AReadOnlyDatabaseLosesEventsAndRecovers)
     });
 }
 
-TEST_F(SqliteKeeperTest, WithoutWriteAccessAnybodyReadsWhatTheServiceLeft)
+TEST_F(SqliteKeeperTest, AUserWhoMayOnlyReadReadsTheStoreOfAnEndedService)
 {
     if (::getuid() != 0)
         GTEST_SKIP() << "only a privileged user can become one without write access";

@@ -92,7 +92,7 @@ TEST(RingBufferPages, SkipWhatWasTakenBackButNotItsTime)
 
 TEST(RingBufferPages, EndWithPadding)
 {
-    const auto reading = read(RingBufferPageBuilder(1).record(2, "last").endOfData().bytes("whatever").page());
+    const auto reading = read(RingBufferPageBuilder(1).record(2, "last").endOfData().bytes("left over").page());
     EXPECT_THAT(reading.records, ElementsAre(Pair(2U, "last")));
     EXPECT_FALSE(reading.isBroken);
 }
