@@ -24,6 +24,9 @@ constexpr std::uint32_t changesOfFiles =
 // A touch changes a file's times and may not even open it.
 constexpr std::uint32_t writesOfFiles = IN_CLOSE_WRITE | IN_MOVED_TO | IN_ATTRIB;
 constexpr std::uint32_t endsOfDirectories = IN_DELETE_SELF | IN_MOVE_SELF;
+// Without IN_MASK_ADD the kernel clears the events of a directory that is watched already, and sets them again: a
+// change between the two is not reported.
+constexpr std::uint32_t ofEachDirectory = changesOfFiles | endsOfDirectories | IN_ONLYDIR | IN_MASK_ADD;
 
 bool isThere(const fs::path& directory)
 {
@@ -119,8 +122,7 @@ void ConfigurationWatcher::armFor(const fs::path& wanted)
 ConfigurationWatcher::Place* ConfigurationWatcher::add(fs::path& directory, std::string& missing)
 {
     for (;;) {
-        const int descriptor =
-            ::inotify_add_watch(inotify_.get(), directory.c_str(), changesOfFiles | endsOfDirectories | IN_ONLYDIR);
+        const int descriptor = ::inotify_add_watch(inotify_.get(), directory.c_str(), ofEachDirectory);
         if (descriptor >= 0) {
             Place& place = places_[descriptor];
             place.directory = directory;
