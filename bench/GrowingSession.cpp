@@ -48,9 +48,10 @@ private:
     void send(const foundation::Dictionary& message)
     {
         ++size_;
-        session_.sendMessage(message, sampleCategory, sampleType, nullptr);
+        session_.sendMessage(tally_, message, sampleCategory, sampleType, nullptr);
     }
 
+    ledger::Tally tally_;
     KestoReportingSession session_{sampleReporterID, {1}};
     std::uint32_t size_ = 0;
     std::uint32_t number_ = numberMark;

@@ -49,7 +49,9 @@ std::shared_ptr<KestoReportingSession> makeLongSession()
 {
     auto session = std::make_shared<KestoReportingSession>(sampleReporterID, std::vector<std::int32_t>{1});
     session->start();
-    sendMessages([&](const auto& message) { session->sendMessage(message, sampleCategory, sampleType, nullptr); });
+    ledger::Tally tally;
+    sendMessages(
+        [&](const auto& message) { session->sendMessage(tally, message, sampleCategory, sampleType, nullptr); });
     return session;
 }
 

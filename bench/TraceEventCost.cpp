@@ -102,7 +102,7 @@ public:
     explicit HandingService(platform::EmitterAccess& access)
     {
         auto socket = platform::ListeningSocket::bind(path());
-        auto listener = socket ? platform::LinuxConnectionListener::create(*std::move(socket), category_)
+        auto listener = socket ? platform::LinuxConnectionListener::create(*std::move(socket), ledger_, category_)
                                : std::unexpected(std::error_code(EADDRINUSE, std::generic_category()));
         if (!listener)
             throw std::runtime_error("no service can listen");
@@ -131,6 +131,7 @@ private:
         return true;
     }
 
+    ledger::Ledger ledger_;
     static inline constinit platform::LogCategory category_{"com.quarn.kesto", "bench"};
     const support::TemporaryDirectory directory_;
     std::unique_ptr<platform::LinuxConnectionListener> listener_;

@@ -81,6 +81,7 @@ private:
 class KeepingConnection final : public platform::Connection {
 public:
     [[nodiscard]] std::int32_t processIdentifier() const override { return 1; }
+    [[nodiscard]] std::uint32_t userIdentifier() const override { return 0; }
     [[nodiscard]] std::string description() const override { return "the fuzzer"; }
     void setCallHandler(CallHandler) override { }
     void setInterruptionHandler(EndHandler) override { }

@@ -63,6 +63,7 @@ private:
 
     private:
         [[nodiscard]] std::int32_t processIdentifier() const override { return 1; }
+        [[nodiscard]] std::uint32_t userIdentifier() const override { return 0; }
         [[nodiscard]] std::string description() const override { return "connection"; }
         void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
         void setInterruptionHandler(EndHandler) override { }

@@ -18,6 +18,7 @@ public:
         : deviceProperties_(filesOfInternalBuild != nullptr)
     {
         platform::install({.log = log_,
+                           .ledger = ledger_,
                            .clock = clock_,
                            .workQueues = workQueues_,
                            .preferences = preferences_,
@@ -207,6 +208,7 @@ private:
     };
 
     Log log_;
+    ledger::Ledger ledger_;
     Clock clock_;
     WorkQueues workQueues_;
     Preferences preferences_;

@@ -2,12 +2,15 @@
 #include "client/KestoReportingClientServerInstance.h"
 
 #include "foundation/text/Format.h"
+#include "platform/Platform.h"
 #include "utility/KestoReportingUtility.h"
 #include "utility/ServerQueue.h"
 #include "utility/ServiceTraceCodes.h"
 
 #include <algorithm>
 #include <cstdlib>
+
+using ledger::Counter;
 
 namespace {
 
@@ -22,8 +25,10 @@ bool isRegistered(const KestoReportingServiceDelegateProtocol& delegate,
 } // namespace
 
 KestoReportingClientServerInstance::KestoReportingClientServerInstance(
-    std::int32_t processIdentifier, std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate)
+    std::int32_t processIdentifier, std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate,
+    std::uint32_t userIdentifier)
     : processIdentifier_(processIdentifier),
+      userIdentifier_(userIdentifier),
       delegate_(std::move(delegate)),
       budget_(std::make_shared<session::StorageBudget>(session::StorageBudget::clientLimit,
                                                        session::StorageBudget::service()))
@@ -34,6 +39,8 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
 KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
 {
     sessionsOfTheService -= clientReportingSessionMap_.size();
+    if (platform::isInstalled())
+        platform::current().ledger.count(Counter::SessionsGone, clientReportingSessionMap_.size());
     if (sessionsRefused_ != 0)
         KESTO_LOG(KestoReportingClientCategory(), Error,
                   "client {} was refused {} sessions: it may have {}, and all clients {}", processIdentifier_,
@@ -70,6 +77,11 @@ void KestoReportingClientServerInstance::setClientProcessName(std::optional<std:
     clientProcessName_ = std::move(name);
 }
 
+ledger::Culprit KestoReportingClientServerInstance::culprit() const
+{
+    return {.user = userIdentifier_, .process = clientProcessName().value_or(std::string()), .application = {}};
+}
+
 std::shared_ptr<KestoReportingSession>
 KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t reporterID, bool acrossAllClients) const
 {
@@ -80,22 +92,27 @@ KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t repor
     return delegate ? delegate->findReportingSessionForID(reporterID) : nullptr;
 }
 
-void KestoReportingClientServerInstance::addSession(std::int64_t reporterID, Session session)
+void KestoReportingClientServerInstance::addSession(ledger::Tally& tally, std::int64_t reporterID, Session session)
 {
     utility::assertServerQueue();
     const std::size_t before = clientReportingSessionMap_.size();
     clientReportingSessionMap_.set(reporterID, std::move(session));
-    sessionsOfTheService += clientReportingSessionMap_.size() - before;
+    const std::size_t added = clientReportingSessionMap_.size() - before;
+    sessionsOfTheService += added;
+    tally.add(Counter::SessionsCreated);
+    tally.add(Counter::SessionsGone, 1 - added); // the one that it replaces
     if (const auto delegate = delegate_.lock())
         delegate->reporterIDAdded(reporterID, *this);
 }
 
-void KestoReportingClientServerInstance::removeSession(std::int64_t reporterID)
+void KestoReportingClientServerInstance::removeSession(ledger::Tally& tally, std::int64_t reporterID)
 {
     utility::assertServerQueue();
     const std::size_t before = clientReportingSessionMap_.size();
     clientReportingSessionMap_.remove(reporterID);
-    sessionsOfTheService -= before - clientReportingSessionMap_.size();
+    const std::size_t removed = before - clientReportingSessionMap_.size();
+    sessionsOfTheService -= removed;
+    tally.add(Counter::SessionsGone, removed);
     if (const auto delegate = delegate_.lock())
         delegate->reporterIDRemoved(reporterID, *this);
 }
@@ -109,12 +126,12 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
         const bool isRoom =
             self.clientReportingSessionMap_.size() < mostSessions && sessionsOfTheService < mostSessionsOfTheService;
         if (replaces || isRoom) {
-            self.addSession(reporterID,
+            self.addSession(turn.tally, reporterID,
                             std::make_shared<KestoReportingSession>(reporterID, std::vector{self.processIdentifier_},
-                                                                    self.budget_));
+                                                                    self.budget_, self.culprit()));
             KESTO_LOG(KestoReportingClientCategory(), Default, "session created for reporter {}", reporterID);
         } else {
-            self.countRefusedSession();
+            self.countRefusedSession(turn.tally);
         }
         reply(turn, std::nullopt, true);
     });
@@ -122,8 +139,9 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
 
 // The first refusal has a log line, in time for the administrator to act. The others are counted, because a client can
 // cause any number of them.
-void KestoReportingClientServerInstance::countRefusedSession()
+void KestoReportingClientServerInstance::countRefusedSession(ledger::Tally& tally)
 {
+    tally.add(Counter::SessionsRefused);
     if (sessionsRefused_++ == 0)
         KESTO_LOG(KestoReportingClientCategory(), Error,
                   "client {} is refused a session: it may have {}, and all clients {}; further ones are counted until "
@@ -189,12 +207,13 @@ void KestoReportingClientServerInstance::start(platform::Turn& turn, KestoReport
                                                const Session& session, const SuccessReply& reply)
 {
     session->start();
+    turn.tally.add(Counter::SessionsStarted);
     session->setDriverSnapShot(delegate.getSnapShot());
     if (const auto& earlier = session->transactionCompleteBlock())
         earlier(turn, std::nullopt, true);
     session->setTransactionCompleteBlock(reply);
     if (const auto features = delegate.getFeaturesState())
-        session->sendMessage(features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
+        session->sendMessage(turn.tally, features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
     if (session->mayBeTraced())
         reply(turn, std::nullopt, true);
     logActiveSessions(delegate);
@@ -238,7 +257,7 @@ void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t re
         if (const auto session = self.clientReportingSessionMap_.find(reporterID)) {
             if (session->started())
                 session->stop(turn);
-            self.removeSession(reporterID);
+            self.removeSession(turn.tally, reporterID);
         }
         KESTO_LOG(KestoReportingClientCategory(), Default, "destroying {}", reporterID);
         reply(turn, std::nullopt, true);
@@ -292,7 +311,8 @@ void KestoReportingClientServerInstance::handleConnectionError()
             if (session->started())
                 session->stop(turn);
         }
-        std::ranges::for_each(reporterIDs, [&](std::int64_t reporterID) { self.removeSession(reporterID); });
+        std::ranges::for_each(reporterIDs,
+                              [&](std::int64_t reporterID) { self.removeSession(turn.tally, reporterID); });
         delegate->removeClient(self.shared_from_this());
         KESTO_LOG(KestoReportingClientCategory(), Default, "removing {} from the server client list",
                   self.processIdentifier_);

@@ -33,7 +33,8 @@ public:
     static constexpr std::size_t mostBytesOfADelivery = std::size_t{64} << 20;
 
     KestoReportingClientServerInstance(std::int32_t processIdentifier,
-                                       std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate);
+                                       std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate,
+                                       std::uint32_t userIdentifier = 0);
     ~KestoReportingClientServerInstance() override;
     KestoReportingClientServerInstance(const KestoReportingClientServerInstance&) = delete;
     KestoReportingClientServerInstance& operator=(const KestoReportingClientServerInstance&) = delete;
@@ -75,6 +76,7 @@ private:
         AudioEventCategory category;
         std::uint16_t type;
         std::int32_t sender;
+        std::uint32_t user;
         std::string processName;
     };
     using Session = std::shared_ptr<KestoReportingSession>;
@@ -93,18 +95,20 @@ private:
     void deliverToActiveSessions(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
                                  const Message& message);
     [[nodiscard]] static std::size_t mostReceivers(const Message& message, std::size_t wanted);
-    void countRefusedSession();
-    void countRefusedReceivers(std::size_t receivers);
+    void countRefusedSession(ledger::Tally& tally);
+    void countRefusedReceivers(ledger::Tally& tally, const Message& message, std::size_t receivers);
     static void deliverStandalone(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
                                   const Message& message);
     static void deliverToSinks(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
                                const Message& message, const Session& session);
-    static void deliverToSession(const Message& message, const Session& session);
+    static void deliverToSession(platform::Turn& turn, const Message& message, const Session& session);
+    [[nodiscard]] ledger::Culprit culprit() const;
     static void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
-    void addSession(std::int64_t reporterID, Session session);
-    void removeSession(std::int64_t reporterID);
+    void addSession(ledger::Tally& tally, std::int64_t reporterID, Session session);
+    void removeSession(ledger::Tally& tally, std::int64_t reporterID);
 
     const std::int32_t processIdentifier_;
+    const std::uint32_t userIdentifier_;
     std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);
     std::optional<std::string> clientProcessName_ KESTO_GUARDED_BY(registrationLock_);
     client::SessionMap clientReportingSessionMap_;

@@ -23,23 +23,25 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
     // The sender is the process that makes this call, which need not be the process that this client was made for.
     const platform::Connection* caller = platform::Connection::current();
     const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
+    const std::uint32_t user = caller != nullptr ? caller->userIdentifier() : userIdentifier_;
     auto processName = KestoReportingUtilityProcessNameForPID(sender);
-    submit([message = Message{std::move(message), category, type, sender, std::move(processName).value_or("(null)")},
-            reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
-        KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
-                  reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
-        utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
-        const auto delegate = self.delegate_.lock();
-        if (!delegate)
-            return reply(turn, std::nullopt);
-        if (!delegate->isReportingEnabled())
-            return reply(turn, utility::reportingDisabled);
-        if (reporterIDs)
-            self.deliverToReporters(turn, *delegate, message, *reporterIDs);
-        else
-            self.deliverToActiveSessions(turn, *delegate, message);
-        reply(turn, std::nullopt);
-    });
+    submit(
+        [message = Message{std::move(message), category, type, sender, user, std::move(processName).value_or("(null)")},
+         reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
+            KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
+                      reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
+            utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
+            const auto delegate = self.delegate_.lock();
+            if (!delegate)
+                return reply(turn, std::nullopt);
+            if (!delegate->isReportingEnabled())
+                return reply(turn, utility::reportingDisabled);
+            if (reporterIDs)
+                self.deliverToReporters(turn, *delegate, message, *reporterIDs);
+            else
+                self.deliverToActiveSessions(turn, *delegate, message);
+            reply(turn, std::nullopt);
+        });
 }
 
 void KestoReportingClientServerInstance::deliverToReporters(platform::Turn& turn,
@@ -58,9 +60,9 @@ void KestoReportingClientServerInstance::deliverToReporters(platform::Turn& turn
         }
         --room;
         deliverToSinks(turn, delegate, message, session);
-        deliverToSession(message, session);
+        deliverToSession(turn, message, session);
     }
-    countRefusedReceivers(refused);
+    countRefusedReceivers(turn.tally, message, refused);
 }
 
 void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn& turn,
@@ -71,9 +73,9 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn&
     KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active.size(),
               client::descriptionOfSessions(active));
     const std::size_t receivers = std::min(active.size(), mostReceivers(message, active.size()));
-    countRefusedReceivers(active.size() - receivers);
+    countRefusedReceivers(turn.tally, message, active.size() - receivers);
     for (const auto& session : std::span(active).first(receivers)) {
-        deliverToSession(message, session);
+        deliverToSession(turn, message, session);
         deliverToSinks(turn, delegate, message, session);
     }
     if (active.empty())
@@ -88,8 +90,12 @@ std::size_t KestoReportingClientServerInstance::mostReceivers(const Message& mes
     return std::max<std::size_t>(mostBytesOfADelivery / message.payload.roughBytes(), 1);
 }
 
-void KestoReportingClientServerInstance::countRefusedReceivers(std::size_t receivers)
+void KestoReportingClientServerInstance::countRefusedReceivers(ledger::Tally& tally, const Message& message,
+                                                               std::size_t receivers)
 {
+    tally.add(ledger::Counter::Deliveries, receivers);
+    tally.add(ledger::Counter::RefusedForSize,
+              {.user = message.user, .process = message.processName, .application = {}}, receivers);
     if (receiversRefused_ == 0 && receivers != 0)
         KESTO_LOG(
             KestoReportingClientCategory(), Error,
@@ -111,14 +117,14 @@ void KestoReportingClientServerInstance::deliverStandalone(platform::Turn& turn,
         foundation::Dictionary{{utility::hostApplicationKey, "Unknown"}});
     session->updateConfigurationWithContentsOfConfiguration(delegate.getDefaults());
     deliverToSinks(turn, delegate, message, session);
-    deliverToSession(message, session);
+    deliverToSession(turn, message, session);
 }
 
 void KestoReportingClientServerInstance::deliverToSinks(platform::Turn& turn,
                                                         KestoReportingServiceDelegateProtocol& delegate,
                                                         const Message& message, const Session& session)
 {
-    const auto& [payload, category, type, sender, processName] = message;
+    const auto& [payload, category, type, sender, user, processName] = message;
     KestoReportingFennicBridge::handleEvent(turn, payload, category, type, session);
     KestoReportingGimboUtility::handleEvent(payload, category, type, session);
     KestoReportingTrelmBridge::handleEvent(payload, category, type, session);
@@ -126,7 +132,8 @@ void KestoReportingClientServerInstance::deliverToSinks(platform::Turn& turn,
     delegate.handleEventForVorp(payload, category, type, session, processName);
 }
 
-void KestoReportingClientServerInstance::deliverToSession(const Message& message, const Session& session)
+void KestoReportingClientServerInstance::deliverToSession(platform::Turn& turn, const Message& message,
+                                                          const Session& session)
 {
-    session->sendMessage(message.payload, message.category, message.type, nullptr);
+    session->sendMessage(turn.tally, message.payload, message.category, message.type, nullptr);
 }

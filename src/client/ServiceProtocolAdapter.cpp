@@ -5,6 +5,7 @@
 #include "client/ServiceOperations.h"
 #include "foundation/cbor/Cbor.h"
 #include "foundation/text/Format.h"
+#include "platform/Platform.h"
 
 #include <array>
 #include <limits>
@@ -219,6 +220,14 @@ static_assert(
     }(std::make_index_sequence<std::tuple_size_v<decltype(serviceProtocolFunctions)>>()),
     "the protocol declares an operation otherwise than the table of the operations");
 
+// The ledger's counters of calls stand in the order of the operations' numbers.
+constexpr ledger::Counter counterOfCalls(std::int64_t method)
+{
+    constexpr auto first = static_cast<std::int64_t>(ledger::Counter::CallsCreateReportingSession);
+    static_assert(static_cast<std::size_t>(ledger::Counter::CallsKillService) == first + serviceOperations.size() - 1);
+    return static_cast<ledger::Counter>(first + method - 1);
+}
+
 std::unexpected<Connection::Violation> violation(std::string reason)
 {
     return std::unexpected(Connection::Violation{std::move(reason)});
@@ -247,6 +256,7 @@ std::expected<void, Connection::Violation> ServiceProtocolAdapter::handleCall(Co
         return violation(foundation::format("{} takes {} arguments, not {}", operation->name(),
                                             operation->arguments().size(), given.size()));
 
+    platform::current().ledger.count(counterOfCalls(*methodNumber));
     Arguments arguments(operation->arguments(), given, ReplyAddress(std::move(call.caller), *callNumber));
     calls[static_cast<std::size_t>(*methodNumber) - 1](arguments, *exportedObject_);
     if (arguments.refusal())

@@ -62,7 +62,7 @@ void send(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& se
     if (stats.empty())
         return;
     const foundation::Dictionary message(std::move(stats));
-    session->sendMessage(message, categoryCavlet, type, nullptr);
+    session->sendMessage(turn.tally, message, categoryCavlet, type, nullptr);
     KestoReportingFennicBridge::handleEvent(turn, message, categoryCavlet, type, session);
 }
 

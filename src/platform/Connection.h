@@ -58,6 +58,8 @@ public:
 
     // The peer's process, as the kernel reported it at acceptance. Any thread.
     [[nodiscard]] virtual std::int32_t processIdentifier() const = 0;
+    // The peer's user, likewise. Any thread.
+    [[nodiscard]] virtual std::uint32_t userIdentifier() const = 0;
     // A text that names the peer, for the log. Any thread.
     [[nodiscard]] virtual std::string description() const = 0;
 

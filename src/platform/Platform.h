@@ -4,6 +4,7 @@
 // reach it as `platform::current()`.
 #pragma once
 
+#include "ledger/Ledger.h"
 #include "platform/Analytics.h"
 #include "platform/BugCapture.h"
 #include "platform/Clock.h"
@@ -26,6 +27,7 @@ namespace platform {
 // References to the providers, all of which outlive the installation.
 struct Platform {
     Log& log;
+    ledger::Ledger& ledger;
     Clock& clock;
     WorkQueues& workQueues;
     Preferences& preferences;

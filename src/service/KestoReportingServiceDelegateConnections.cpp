@@ -19,7 +19,7 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
     std::weak_ptr<Client> weakClient;
     {
         const foundation::Lock lock(lock_);
-        const auto client = std::make_shared<Client>(processIdentifier, weak_from_this());
+        const auto client = std::make_shared<Client>(processIdentifier, weak_from_this(), connection->userIdentifier());
         weakClient = client;
         connection->setCallHandler(
             [adapter = client::ServiceProtocolAdapter(client)](platform::Connection::Call call) mutable {

@@ -69,9 +69,11 @@ void KestoReportingServiceDelegate::handleFeatureChange(std::int32_t token)
     const auto state = getFeaturesState();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "defaults {}",
               state ? foundation::Value(*state).text() : "(null)");
+    ledger::Tally tally;
     for (const auto& client : clients_)
         for (const auto& entry : client->clientReportingSessionMap())
-            entry.session->sendMessage(state, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
+            entry.session->sendMessage(tally, state, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
+    platform::current().ledger.post(tally);
 }
 
 std::string KestoReportingServiceDelegate::descriptionOf(const Features& features)

@@ -47,11 +47,11 @@ int run()
     auto socket = takeSocket(*launch); // first, so that a second service ends before it opens the store of the first
     if (!socket)
         return cannotRun(socket.error());
-    auto listener = platform::LinuxConnectionListener::create(*std::move(socket), KestoReportingClientCategory());
+    platform::LinuxPlatform platform(*launch);
+    auto listener = platform::LinuxConnectionListener::create(*std::move(socket), platform.platform().ledger,
+                                                              KestoReportingClientCategory());
     if (!listener)
         return cannotRun("cannot accept connections: " + listener.error().message());
-
-    platform::LinuxPlatform platform(*launch);
     platform::install(platform.platform());
     platform.removeUnfinished(KestoReportingTracingLogsDirectory());
     (*listener)->setEmitterAccess(platform.emitterAccess());

@@ -42,10 +42,11 @@ std::size_t roughBytes(const session::DriverSnapShot& snapShot)
 } // namespace
 
 KestoReportingSession::KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
-                                             std::shared_ptr<session::StorageBudget> budget)
+                                             std::shared_ptr<session::StorageBudget> budget, ledger::Culprit client)
     : applicationText_(applicationText({})),
       reporterID_(reporterID),
       processIdentifiers_(std::move(processIdentifiers)),
+      client_(std::move(client)),
       budget_(std::move(budget)),
       configurationShare_(budget_),
       driverSnapShotShare_(budget_)
@@ -68,6 +69,15 @@ std::string KestoReportingSession::description() const
                               reporterID_, serviceName_.empty() ? "(null)" : serviceName_,
                               processIdentifiers_.empty() ? 0 : processIdentifiers_.front(), applicationText_,
                               started_ ? 1 : 0);
+}
+
+// The client, in the session's application.
+ledger::Culprit KestoReportingSession::culprit() const
+{
+    ledger::Culprit culprit = client_;
+    const foundation::Lock lock(configurationLock_);
+    culprit.application = applicationText_;
+    return culprit;
 }
 
 void KestoReportingSession::setServiceType(AudioServiceType type)
@@ -96,12 +106,14 @@ void KestoReportingSession::updateConfigurationWithContentsOfConfiguration(
     const foundation::Lock lock(configurationLock_);
     foundation::Dictionary merged = configuration_.mergedWith(*configuration);
     if (foundation::cborSize(merged) > largestConfiguration) {
+        platform::current().ledger.count(ledger::Counter::ConfigurationsRefused);
         KESTO_LOG(KestoReportingSessionCategory(), Error,
                   "configuration of session {} would take more than {} bytes; the change is ignored", reporterID_,
                   largestConfiguration);
         return;
     }
     if (!configurationShare_.resize(merged.roughBytes())) {
+        platform::current().ledger.count(ledger::Counter::ConfigurationsRefused);
         KESTO_LOG(KestoReportingSessionCategory(), Error,
                   "no memory left for the configuration of session {}; the change is ignored", reporterID_);
         return;
@@ -115,6 +127,7 @@ void KestoReportingSession::setDriverSnapShot(std::optional<session::DriverSnapS
 {
     utility::assertServerQueue();
     if (!driverSnapShotShare_.resize(snapShot ? roughBytes(*snapShot) : 0)) {
+        platform::current().ledger.count(ledger::Counter::SnapShotsLost);
         KESTO_LOG(KestoReportingSessionCategory(), Error,
                   "no memory left for the drivers' snapshot of session {}; its driver statistics are lost",
                   reporterID_);
@@ -152,7 +165,8 @@ void KestoReportingSession::stop(platform::Turn& turn)
     utility::emitTraceCode(utility::ServiceTraceCode::SessionStopping);
     sendVolumeEvents(turn);
     writeSummaryJson();
-    sendSummaryEvent();
+    sendSummaryEvent(turn.tally);
+    turn.tally.add(ledger::Counter::SessionsStopped);
     stopTracing();
     if (messagesLost_ != 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for lack of memory", reporterID_,
@@ -196,13 +210,13 @@ void KestoReportingSession::sendVolumeEvents(platform::Turn& turn)
     for (auto& next : volumeEvents) {
         const auto volumeEvent = std::exchange(next, {}); // freed as soon as the store has it
         share.shrink(static_cast<std::size_t>(static_cast<double>(volumeEvent.roughBytes()) * paidForAByte));
-        sendMessage(volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
+        sendMessage(turn.tally, volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
         KestoReportingFennicBridge::handleEvent(turn, volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,
                                                 shared_from_this());
     }
 }
 
-void KestoReportingSession::sendSummaryEvent()
+void KestoReportingSession::sendSummaryEvent(ledger::Tally& tally)
 {
     const auto summary = createSummaryEventForSession();
     if (!summary)
@@ -212,5 +226,5 @@ void KestoReportingSession::sendSummaryEvent()
         const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
         nestedAggregatedPayloadData_->keepLargePayloadsAsTheyCome(); // no analysis reads them any more
     }
-    sendMessage(summary, AudioEventCategoryUndefined, AudioEventTypeUnknown, true, nullptr);
+    sendMessage(tally, summary, AudioEventCategoryUndefined, AudioEventTypeUnknown, true, nullptr);
 }

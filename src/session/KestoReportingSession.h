@@ -7,6 +7,7 @@
 
 #include "foundation/Mutex.h"
 #include "foundation/values/Value.h"
+#include "ledger/Tally.h"
 #include "session/DriverSnapShot.h"
 #include "session/MessageStore.h"
 #include "sinks/SinkSession.h"
@@ -35,9 +36,10 @@ class KestoReportingSession final : public sinks::SinkSession,
                                     public std::enable_shared_from_this<KestoReportingSession> {
 public:
     // The identity never changes. The first process is the session's owner. The budget pays for what the session keeps
-    // for its client.
+    // for its client, whom the ledger charges with what is refused.
     KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
-                          std::shared_ptr<session::StorageBudget> budget = session::StorageBudget::service());
+                          std::shared_ptr<session::StorageBudget> budget = session::StorageBudget::service(),
+                          ledger::Culprit client = {});
     ~KestoReportingSession() override;
     KestoReportingSession(const KestoReportingSession&) = delete;
     KestoReportingSession& operator=(const KestoReportingSession&) = delete;
@@ -85,16 +87,16 @@ public:
 
     // `sendMessage` calls it before it returns; `sendSingleMessage` never calls it.
     using MessageReply = std::function<void(const std::optional<utility::ReplyError>& error)>;
-    // Normalises and records the message, then calls the reply, if there is one, without an error. `sync` has no
-    // effect: the message is always handled before this returns, on the caller's thread. An absent message counts as an
-    // empty one.
-    void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
-                     AudioEventType type, bool sync, const MessageReply& reply);
-    void sendMessage(const std::optional<foundation::Dictionary>& message, AudioEventCategory category,
-                     AudioEventType type, const MessageReply& reply);
+    // Normalises and records the message, counts what became of it, then calls the reply, if there is one, without an
+    // error. `sync` has no effect: the message is always handled before this returns, on the caller's thread. An absent
+    // message counts as an empty one.
+    void sendMessage(ledger::Tally& tally, const std::optional<foundation::Dictionary>& message,
+                     AudioEventCategory category, AudioEventType type, bool sync, const MessageReply& reply);
+    void sendMessage(ledger::Tally& tally, const std::optional<foundation::Dictionary>& message,
+                     AudioEventCategory category, AudioEventType type, const MessageReply& reply);
     // Records the normalised message unless it repeats the previous one of its kind. True if it was dropped as a
     // repetition.
-    bool createMessageIdentifier(AudioEventCategory category, AudioEventType type,
+    bool createMessageIdentifier(ledger::Tally& tally, AudioEventCategory category, AudioEventType type,
                                  const foundation::Dictionary& message);
     // Accepts a message outside any session and, a second later, does nothing with it. The reply is not called.
     static void sendSingleMessage(const foundation::Dictionary& message, AudioEventCategory category,
@@ -161,7 +163,7 @@ private:
     [[nodiscard]] std::shared_ptr<const session::MessageStore> store() const;
     [[nodiscard]] std::string summaryFileName() const;
     void sendVolumeEvents(platform::Turn& turn);
-    void sendSummaryEvent();
+    void sendSummaryEvent(ledger::Tally& tally);
     void letGoOfMessages();
     void startTracing();
     void stopTracing();
@@ -183,6 +185,9 @@ private:
     std::unique_ptr<TraceParams> traceParams_;
     std::unique_ptr<TraceRunner> traceRunner_;
 
+    [[nodiscard]] ledger::Culprit culprit() const;
+
+    const ledger::Culprit client_;
     const std::shared_ptr<session::StorageBudget> budget_;
     session::StorageShare configurationShare_ KESTO_GUARDED_BY(configurationLock_);
     session::StorageShare driverSnapShotShare_;

@@ -9,38 +9,44 @@
 #include <chrono>
 #include <random>
 
-void KestoReportingSession::sendMessage(const std::optional<foundation::Dictionary>& message,
+void KestoReportingSession::sendMessage(ledger::Tally& tally, const std::optional<foundation::Dictionary>& message,
                                         AudioEventCategory category, AudioEventType type, [[maybe_unused]] bool sync,
                                         const MessageReply& reply)
 {
     utility::assertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending message for session owned by {}", reporterID_);
-    createMessageIdentifier(category, type,
+    createMessageIdentifier(tally, category, type,
                             utility::normaliseMessage(message.value_or(foundation::Dictionary()), category, type));
     utility::emitTraceCode(utility::ServiceTraceCode::SessionMessageAccepted);
     if (reply)
         reply(std::nullopt);
 }
 
-void KestoReportingSession::sendMessage(const std::optional<foundation::Dictionary>& message,
+void KestoReportingSession::sendMessage(ledger::Tally& tally, const std::optional<foundation::Dictionary>& message,
                                         AudioEventCategory category, AudioEventType type, const MessageReply& reply)
 {
-    sendMessage(message, category, type, false, reply);
+    sendMessage(tally, message, category, type, false, reply);
 }
 
-bool KestoReportingSession::createMessageIdentifier(AudioEventCategory category, AudioEventType type,
-                                                    const foundation::Dictionary& message)
+bool KestoReportingSession::createMessageIdentifier(ledger::Tally& tally, AudioEventCategory category,
+                                                    AudioEventType type, const foundation::Dictionary& message)
 {
+    using ledger::Counter;
+    tally.add(Counter::Deliveries);
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    if (!nestedAggregatedPayloadData_)
+    if (!nestedAggregatedPayloadData_) {
+        tally.add(Counter::Inert);
         return false;
+    }
     switch (nestedAggregatedPayloadData_->record(category, type, message)) {
-    case session::MessageStore::Outcome::Recorded: return false;
+    case session::MessageStore::Outcome::Recorded: tally.add(Counter::Recorded); return false;
     case session::MessageStore::Outcome::Redundant:
+        tally.add(Counter::Repeated);
         KESTO_LOG(KestoReportingSessionCategory(), Debug, "dropping redundant event");
         return true;
     case session::MessageStore::Outcome::Full: break;
     }
+    tally.add(Counter::RefusedForMemory, culprit());
     if (messagesLost_++ == 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error,
                   "no memory left for the messages of session {}; they are lost until sessions stop", reporterID_);

@@ -211,6 +211,7 @@ std::optional<Dictionary> KestoReportingSession::createSummaryEventForSession() 
     auto summary = std::move(values).finish();
     if (!summary) {
         ++messagesLost_;
+        platform::current().ledger.count(ledger::Counter::SummariesLost);
         KESTO_LOG(KestoReportingSessionCategory(), Error, "no memory left for the summary of session {}; it is lost",
                   reporterID_);
     }

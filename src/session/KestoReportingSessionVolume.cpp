@@ -3,6 +3,7 @@
 //
 // The switches of spatial audio arrive in bursts, which are folded into one payload first.
 #define KESTO_LOG_NAME "KestoReportingSession"
+#include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
 #include "session/RapidMessages.h"
 #include "session/VolumeFields.h"
@@ -133,6 +134,7 @@ public:
             events_.front().back() = count;
             events.emplace_back(shapeOfEvents(), events_.front());
         }
+        platform::current().ledger.count(ledger::Counter::VolumeEventsLost, eventsBeyondBound_ + eventsUnpaid_);
         if (eventsBeyondBound_ != 0)
             KESTO_LOG(KestoReportingSessionBlinReportingCategory(), Error,
                       "{} volume events are lost: with them all would take more than {} bytes", eventsBeyondBound_,

@@ -78,8 +78,10 @@ void KestoReportingFennicBridge::handleEvent(platform::Turn& turn, const foundat
     platform::Analytics& analytics = platform::current().analytics;
     std::shared_ptr<LazyPayload> payload;
     const auto offer = [&](const std::string& eventName) {
-        if (!analytics.isAnalyticsEventUsed(eventName))
-            return;
+        if (!analytics.isAnalyticsEventUsed(eventName)) {
+            turn.tally.add(ledger::Counter::Events);
+            return turn.tally.add(ledger::Counter::Unwanted);
+        }
         if (!payload)
             payload = std::make_shared<LazyPayload>(message, session);
         analytics.sendAnalyticsEventLazy(turn, eventName, [payload] { return payload->build(); });

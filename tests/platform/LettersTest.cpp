@@ -18,6 +18,7 @@ public:
     Recipient(std::string name, std::vector<std::string>& post) : name_(std::move(name)), post_(post) { }
 
     [[nodiscard]] std::int32_t processIdentifier() const override { return 1; }
+    [[nodiscard]] std::uint32_t userIdentifier() const override { return 0; }
     [[nodiscard]] std::string description() const override { return name_; }
     void setCallHandler(CallHandler /*handler*/) override { }
     void setInterruptionHandler(EndHandler /*handler*/) override { }

@@ -43,7 +43,7 @@ protected:
     void send(const std::optional<Dictionary>& message, AudioEventCategory category = playback,
               AudioEventType type = start)
     {
-        session->sendMessage(message, category, type, nullptr);
+        session->sendMessage(platform.turn.tally, message, category, type, nullptr);
     }
     // The recorded payload; the session sets the tag itself.
     [[nodiscard]] std::vector<Dictionary> recorded() const { return session->nestedAggregatedPayloadData().value(); }
@@ -253,10 +253,10 @@ TEST_F(SessionMessagesTest, ThatHaveMoreOrFewerKeysAreOtherMessages)
 
 TEST_F(SessionMessagesTest, TellWhetherTheyWereDropped)
 {
-    EXPECT_FALSE(session->createMessageIdentifier(playback, start, {{"a", 1}}));
-    EXPECT_TRUE(session->createMessageIdentifier(playback, start, {{"a", 1}}));
-    EXPECT_FALSE(session->createMessageIdentifier(playback, errorType, {{"a", 1}}));
-    EXPECT_FALSE(session->createMessageIdentifier(playback, errorType, {{"a", 1}}));
+    EXPECT_FALSE(session->createMessageIdentifier(platform.turn.tally, playback, start, {{"a", 1}}));
+    EXPECT_TRUE(session->createMessageIdentifier(platform.turn.tally, playback, start, {{"a", 1}}));
+    EXPECT_FALSE(session->createMessageIdentifier(platform.turn.tally, playback, errorType, {{"a", 1}}));
+    EXPECT_FALSE(session->createMessageIdentifier(platform.turn.tally, playback, errorType, {{"a", 1}}));
     EXPECT_THAT(recorded().front(), record("Playback_Start_1", {{"a", 1}})) << "as given";
 }
 
@@ -268,7 +268,7 @@ TEST_F(SessionMessagesTest, ToASessionThatIsNotStartedAreNotRecorded)
     platform.log.clear();
     platform.traceEmitter.take();
     send(Dictionary{{"a", 1}});
-    EXPECT_FALSE(session->createMessageIdentifier(playback, start, {{"a", 1}}));
+    EXPECT_FALSE(session->createMessageIdentifier(platform.turn.tally, playback, start, {{"a", 1}}));
     EXPECT_EQ(session->nestedAggregatedPayloadData(), std::nullopt);
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "sending message for session owned by 42")));
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(acceptedMarker));
@@ -292,18 +292,18 @@ TEST_F(SessionMessagesTest, AreAnsweredBeforeTheCallReturnsWithNoErrorWhateverBe
         ++replies;
     };
     for (const bool sync : {true, false})
-        session->sendMessage(Dictionary{{"a", 1}}, playback, start, sync, reply);
-    session->sendMessage(Dictionary{{"a", 1}}, playback, start, reply);
+        session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, playback, start, sync, reply);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, playback, start, reply);
     session->stop(platform.turn);
     platform.traceEmitter.take();
-    session->sendMessage(Dictionary{{"a", 1}}, playback, start, reply);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, playback, start, reply);
     EXPECT_EQ(replies, 4);
 }
 
 TEST_F(SessionMessagesTest, AreHandledTheSameSynchronouslyOrNot)
 {
-    session->sendMessage(Dictionary{{"a", 1}}, playback, start, true, nullptr);
-    session->sendMessage(Dictionary{{"a", 2}}, playback, start, false, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, playback, start, true, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 2}}, playback, start, false, nullptr);
     EXPECT_THAT(identifiers(), ElementsAre("Playback_Start_1", "Playback_Start_2"));
     EXPECT_EQ(platform.workQueues.pending(), 0U);
 }
@@ -317,10 +317,10 @@ TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
     KestoReportingSession session(42, {7}, budget);
     session.start();
     const std::string large(600, 'x');
-    session.sendMessage(Dictionary{{"a", large}}, playback, start, nullptr);
+    session.sendMessage(platform.turn.tally, Dictionary{{"a", large}}, playback, start, nullptr);
     platform.log.clear();
     for (const int value : {1, 2, 3})
-        session.sendMessage(Dictionary{{"a", large}, {"b", value}}, playback, start, nullptr);
+        session.sendMessage(platform.turn.tally, Dictionary{{"a", large}, {"b", value}}, playback, start, nullptr);
     EXPECT_THAT(session.nestedAggregatedPayloadData().value(), SizeIs(1));
     EXPECT_THAT(platform.log.lines(),
                 Contains(IsLine(Error, "kerr",

@@ -38,7 +38,7 @@ protected:
 
     void send(double time, const Dictionary& message)
     {
-        session->sendMessage(message.with("kestoreporting_timestamp", time), playback, 1, nullptr);
+        session->sendMessage(platform.turn.tally, message.with("kestoreporting_timestamp", time), playback, 1, nullptr);
     }
     // Plays 30 seconds at one volume and 70 at another.
     void play()
@@ -204,7 +204,7 @@ TEST_F(SessionStop, RecordsNoVolumeEventThatRepeatsTheOneBeforeButHandsItToTheBr
                                       {"play_secondsBucketed", "30"},
                                       {"msgidx", 1},
                                       {"msgcnt", 2}};
-    session->sendMessage(asTheFirstWillBe.with("kestoreporting_timestamp", 100), 14, 11, nullptr);
+    session->sendMessage(platform.turn.tally, asTheFirstWillBe.with("kestoreporting_timestamp", 100), 14, 11, nullptr);
     platform.log.clear();
     session->stop(platform.turn);
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Debug, "kerr", "dropping redundant event")).Times(1));

@@ -61,7 +61,10 @@ protected:
         session->start();
     }
 
-    void record(const Dictionary& message) { session->sendMessage(message, playback, AudioEventTypeError, nullptr); }
+    void record(const Dictionary& message)
+    {
+        session->sendMessage(platform.turn.tally, message, playback, AudioEventTypeError, nullptr);
+    }
 
     // Writes the file, and returns the name and text of the only file.
     std::pair<std::string, std::string> write()
@@ -126,7 +129,7 @@ TEST(SummaryFileOnCustomerBuilds, IsNone)
     support::TestPlatform platform;
     const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
     session->start();
-    session->sendMessage(Dictionary{{"a", 1}}, playback, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, playback, 1, nullptr);
     session->writeSummaryJson();
     session->stop(platform.turn);
     EXPECT_THAT(platform.fileSystem.files, IsEmpty());
@@ -157,7 +160,7 @@ TEST_F(SummaryFile, TakesThePlaceOfAnEarlierOneOfTheSameSecond)
     other->setServiceType(7);
     other->setConfiguration(Dictionary{{"HostApplicationDisplayID", "org.player"}});
     other->start();
-    other->sendMessage(Dictionary{{"b", 2}}, playback, 1, nullptr);
+    other->sendMessage(platform.turn.tally, Dictionary{{"b", 2}}, playback, 1, nullptr);
     other->stop(platform.turn);
     ASSERT_THAT(platform.fileSystem.files, SizeIs(1));
     EXPECT_THAT(platform.fileSystem.files.begin()->second, testing::HasSubstr("\"b\": 2"));
@@ -295,7 +298,7 @@ TEST_F(SummaryFile, IsNotCountedWhenItWasNotWritten)
 TEST_F(SummaryFile, HoldsTheMessagesOneMemberALine)
 {
     record({{"a", 1}, {"list", foundation::Array{true, foundation::Array{}}}, {"inner", Dictionary{{"b", "x"}}}});
-    session->sendMessage(Dictionary{}, 14, 11, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{}, 14, 11, nullptr);
     EXPECT_EQ(write().second, R"([
     {
         "Playback_Error_1": {
@@ -357,7 +360,7 @@ RC_GTEST_PROP(SummaryFileOfAnyStore, SaysToAnotherReaderWhatTheStoreHolds, ())
         const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{});
         session->start();
         for (const Dictionary& payload : payloads)
-            session->sendMessage(payload, playback, AudioEventTypeError, nullptr);
+            session->sendMessage(platform.turn.tally, payload, playback, AudioEventTypeError, nullptr);
         platform.fileSystem.files.clear();
         session->writeSummaryJson();
         const Messages messages = *session->nestedAggregatedPayloadData();

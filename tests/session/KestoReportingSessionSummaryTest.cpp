@@ -27,7 +27,10 @@ protected:
     }
 
     // Records it as an error, because an error is recorded even if it repeats. The session adds "audiotag".
-    void record(const Dictionary& message) { session->sendMessage(message, playback, AudioEventTypeError, nullptr); }
+    void record(const Dictionary& message)
+    {
+        session->sendMessage(platform.turn.tally, message, playback, AudioEventTypeError, nullptr);
+    }
 
     // The summary's entries as text, except those that every summary has.
     std::string summary()
@@ -151,7 +154,8 @@ TEST(SummaryOnCustomerBuilds, IsMadeAndRecordedWithoutTimeStamps)
     support::TestPlatform platform;
     const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{});
     session->start();
-    session->sendMessage(Dictionary{{"a", 1}, {"kestoreporting_timestamp", 12.5}}, playback, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}, {"kestoreporting_timestamp", 12.5}}, playback, 1,
+                         nullptr);
     std::vector<std::string> recorded;
     platform.traceEmitter.setObserver(
         [&](std::uint32_t) { recorded = textsOf(*session->nestedAggregatedPayloadData()); });
@@ -175,7 +179,8 @@ TEST(SummaryOfManyValues, IsLostWhenTheBudgetHasNoRoomForIt)
     session->start();
     const foundation::Array manyTruths(std::vector<Value>(10'000, Value(false)));
     for (int message = 0; message < 2; ++message)
-        session->sendMessage(Dictionary{{"a", manyTruths}}, playback, AudioEventTypeError, nullptr);
+        session->sendMessage(platform.turn.tally, Dictionary{{"a", manyTruths}}, playback, AudioEventTypeError,
+                             nullptr);
     EXPECT_THAT(*session->nestedAggregatedPayloadData(), SizeIs(2));
     const std::size_t taken = budget->taken();
     EXPECT_EQ(session->createSummaryEventForSession(), std::nullopt);
@@ -203,7 +208,7 @@ TEST(SummaryOfManyKeys, PaysForEachOfThem)
         const auto session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{},
                                                                      std::make_shared<session::StorageBudget>(limit));
         session->start();
-        session->sendMessage(message, playback, 1, nullptr);
+        session->sendMessage(platform.turn.tally, message, playback, 1, nullptr);
         EXPECT_THAT(*session->nestedAggregatedPayloadData(), SizeIs(1));
         return session->createSummaryEventForSession();
     };
@@ -220,7 +225,7 @@ TEST(SummaryAndRecorder, KeepOutOfEachOthersWay)
     session->start();
     std::jthread recorder([&] {
         for (int message = 0; message < 10'000; ++message)
-            session->createMessageIdentifier(playback, 1, Dictionary{{"a", message}});
+            session->createMessageIdentifier(platform.turn.tally, playback, 1, Dictionary{{"a", message}});
     });
     std::size_t commas = 0;
     for (int round = 0; round < 100; ++round)
@@ -246,7 +251,7 @@ RC_GTEST_PROP(SummaryOfAnyStore, IsWhatItsDefinitionMakesOfIt, ())
         session->setServiceType(serviceType);
         session->start();
         for (const Dictionary& payload : payloads)
-            session->sendMessage(payload, playback, AudioEventTypeError, nullptr);
+            session->sendMessage(platform.turn.tally, payload, playback, AudioEventTypeError, nullptr);
         const auto summary = session->createSummaryEventForSession();
         const auto expected = naive::createSummaryEvent(*session->nestedAggregatedPayloadData(), serviceType);
         RC_ASSERT(summary.has_value() == expected.has_value());
@@ -264,7 +269,8 @@ TEST_F(Summary, IsMadeOfManyKindsOfLongMessages)
         Dictionary::Entries entries{{"number", number}};
         for (int key = number % 3; key < 100; ++key)
             entries.push_back({foundation::String("key " + std::to_string(key)), key % 7 == 0 ? number / 50 : key});
-        session->sendMessage(Dictionary(std::move(entries)), static_cast<AudioEventCategory>(1 + number % kinds / 2),
+        session->sendMessage(platform.turn.tally, Dictionary(std::move(entries)),
+                             static_cast<AudioEventCategory>(1 + number % kinds / 2),
                              static_cast<AudioEventType>(1 + number % 2), nullptr);
     }
     const Messages messages = *session->nestedAggregatedPayloadData();
@@ -281,7 +287,7 @@ protected:
     {
         for (int message = 0; message < 12; ++message)
             record({{"text", std::string(100'000, static_cast<char>('a' + message))}, {"session_duration", message}});
-        session->sendMessage(large(), AudioEventCategoryUndefined, AudioEventTypeUnknown, nullptr);
+        session->sendMessage(platform.turn.tally, large(), AudioEventCategoryUndefined, AudioEventTypeUnknown, nullptr);
     }
 
     Dictionary large() { return *session->createSummaryEventForSession(); }
@@ -308,7 +314,7 @@ TEST_F(LargeSummary, IsRecordedAsAnyMessageIs)
 TEST_F(LargeSummary, LeavesTheIdentifiersThatFollowInOrder)
 {
     record({{"text", "after"}});
-    session->sendMessage(large(), AudioEventCategoryUndefined, AudioEventTypeUnknown, nullptr);
+    session->sendMessage(platform.turn.tally, large(), AudioEventCategoryUndefined, AudioEventTypeUnknown, nullptr);
     record({{"text", "last"}});
     EXPECT_THAT(lastMessages(4),
                 testing::ElementsAre("Undefined_Unknown_1: 1200011", "Playback_Error_13: 5",
@@ -319,7 +325,7 @@ TEST_F(LargeSummary, LeavesTheIdentifiersThatFollowInOrder)
 TEST_F(LargeSummary, IsDroppedWhenItIsRepeated)
 {
     const Dictionary same = *session->nestedAggregatedPayloadData()->back().begin()->value.dictionary();
-    session->sendMessage(same, AudioEventCategoryUndefined, AudioEventTypeUnknown, nullptr);
+    session->sendMessage(platform.turn.tally, same, AudioEventCategoryUndefined, AudioEventTypeUnknown, nullptr);
     EXPECT_EQ(session->messageIdentifierCounts(), (Dictionary{{"Playback_Error", 12}, {"Undefined_Unknown", 1}}));
 }
 

@@ -365,7 +365,7 @@ TEST_F(SessionTest, BeginsARunWithAnEmptyStore)
 TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
 {
     session->start();
-    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, 4, 1, nullptr);
     session->stop(platform.turn);
     std::optional<std::size_t> messages;
     platform.traceEmitter.setObserver([&](std::uint32_t code) {
@@ -382,7 +382,7 @@ TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
 TEST_F(SessionTest, StartedTwiceGoesOnAsItIs)
 {
     session->start();
-    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, 4, 1, nullptr);
     forget();
     session->start();
     EXPECT_TRUE(session->started());
@@ -397,7 +397,7 @@ TEST_F(SessionTest, StartedTwiceGoesOnAsItIs)
 TEST_F(SessionTest, EndsARunAndDropsWhatItRecorded)
 {
     session->start();
-    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, 4, 1, nullptr);
     forget();
     session->stop(platform.turn);
     EXPECT_FALSE(session->started());
@@ -444,11 +444,11 @@ TEST_F(SessionTest, StoppedWithoutAStartOnlySaysSo)
 TEST_F(SessionTest, BeginsEveryKindAnewInTheNextRun)
 {
     session->start();
-    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
-    session->sendMessage(Dictionary{{"a", 2}}, 4, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, 4, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 2}}, 4, 1, nullptr);
     session->stop(platform.turn);
     session->start();
-    session->sendMessage(Dictionary{{"a", 2}}, 4, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 2}}, 4, 1, nullptr);
     const auto messages = *session->nestedAggregatedPayloadData();
     ASSERT_THAT(messages, SizeIs(1));
     EXPECT_TRUE(messages[0].contains("Playback_Start_1"));
@@ -458,7 +458,7 @@ TEST_F(SessionTest, MarksEveryPointOfItsLifeInOrder)
 {
     session->setServiceType(4);
     session->start();
-    session->sendMessage(Dictionary{{"a", 1}}, 4, 1, nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, 4, 1, nullptr);
     EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(created, started, accepted));
     session->stop(platform.turn);
     EXPECT_EQ(platform.traceEmitter.take().front(), stopping);

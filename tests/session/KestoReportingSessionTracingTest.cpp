@@ -328,8 +328,8 @@ TEST_F(SessionTracing, WritesItsResultsWhenTheSessionStops)
 TEST_F(SessionTracing, StopsBehindTheSummaryAndBeforeTheMessagesAreDropped)
 {
     session->start();
-    session->sendMessage(Dictionary{{"session_output_running", true}}, AudioEventCategory{4}, AudioEventType{1},
-                         nullptr);
+    session->sendMessage(platform.turn.tally, Dictionary{{"session_output_running", true}}, AudioEventCategory{4},
+                         AudioEventType{1}, nullptr);
     platform.log.clear();
     std::vector<std::string> steps;
     platform.log.setObserver([&](const support::LogLine& line) {

@@ -26,6 +26,7 @@ template <typename... Providers>
         return *picked;
     };
     const platform::Platform result{.log = pick(platform.log),
+                                    .ledger = pick(platform.ledger),
                                     .clock = pick(platform.clock),
                                     .workQueues = pick(platform.workQueues),
                                     .preferences = pick(platform.preferences),

@@ -6,6 +6,7 @@ namespace support {
 TestPlatform::TestPlatform()
 {
     platform::install({.log = log,
+                       .ledger = ledger,
                        .clock = clock,
                        .workQueues = workQueues,
                        .preferences = preferences,

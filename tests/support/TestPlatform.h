@@ -26,6 +26,7 @@ public:
     TestPlatform& operator=(const TestPlatform&) = delete;
 
     FakeLog log;
+    ledger::Ledger ledger; // a real one: it needs nothing of a system
     FakeClock clock;
     FakeWorkQueues workQueues{clock};
     platform::Turn turn; // for calls outside any queue; what it gathers goes nowhere

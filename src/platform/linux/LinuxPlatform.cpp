@@ -28,6 +28,7 @@ std::filesystem::path notificationsDirectory(const LaunchConfiguration& launch)
 LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
     : log_(launch.logThresholds, LinuxLog::destinationOfThisProcess()),
       configurationWatcher_(launch.configurationDirectory, ProviderLog(log_)),
+      ledgerFile_(launch.stateDirectory, clock_, ProviderLog(log_)),
       notifications_(notificationsDirectory(launch), configurationWatcher_, ProviderLog(log_)),
       preferences_(configurationWatcher_, ProviderLog(log_)),
       deviceSettings_(configurationWatcher_, ProviderLog(log_)),
@@ -39,7 +40,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       kernelTrace_(TracefsPlace(), traceEmitter_, emitterAccess_, ProviderLog(log_)),
       performanceWriter_(fileSystem_, ProviderLog(log_)),
       analytics_(std::make_unique<SqliteKeeper>(launch.stateDirectory, clock_, ProviderLog(log_)),
-                 configurationWatcher_, clock_, ProviderLog(log_))
+                 configurationWatcher_, clock_, ledger_, ProviderLog(log_))
 {
     preferences_.setChangeHandler([this](std::string_view domain) { notifications_.post(notificationOf(domain)); });
     // The replies of a turn leave once its events are kept.
@@ -49,6 +50,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
 Platform LinuxPlatform::platform()
 {
     return {.log = log_,
+            .ledger = ledger_,
             .clock = clock_,
             .workQueues = workQueues_,
             .preferences = preferences_,

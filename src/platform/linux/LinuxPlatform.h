@@ -24,6 +24,7 @@
 #include "platform/linux/settings/LinuxNotifications.h"
 #include "platform/linux/settings/LinuxPreferences.h"
 #include "platform/linux/store/AnalyticsStore.h"
+#include "platform/linux/store/LedgerFile.h"
 #include "platform/linux/trace/EmitterAccess.h"
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
 #include "platform/linux/trace/TracefsEmitter.h"
@@ -37,7 +38,7 @@ public:
     explicit LinuxPlatform(const LaunchConfiguration& launch);
 
     [[nodiscard]] Platform platform();
-    // Not part of the bundle: it counts kept and lost events, and can write all sent events immediately.
+    // Not part of the bundle: it can write all sent events immediately.
     [[nodiscard]] AnalyticsStore& analyticsStore() noexcept { return analytics_; }
     // For the start: see LinuxFileSystem.
     void removeUnfinished(const std::filesystem::path& folder) { fileSystem_.removeUnfinished(folder); }
@@ -48,6 +49,8 @@ private:
     LinuxLog log_;
     ConfigurationWatcher configurationWatcher_;
     LinuxClock clock_;
+    LedgerFile ledgerFile_;
+    ledger::Ledger ledger_{ledgerFile_.image()};
     LinuxNotifications notifications_;
     LinuxPreferences preferences_; // posts notifications
     LinuxDeviceSettings deviceSettings_;

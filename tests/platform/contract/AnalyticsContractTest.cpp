@@ -56,7 +56,7 @@ public:
     [[nodiscard]] platform::Analytics& analytics() override
     {
         if (!store_)
-            store_.emplace(makeKeeper(), watcher_, clock_, platform::ProviderLog(log_));
+            store_.emplace(makeKeeper(), watcher_, clock_, ledger_, platform::ProviderLog(log_));
         return *store_;
     }
     void use(const std::string& pattern) override
@@ -86,6 +86,7 @@ protected:
 private:
     void configure() { support::replaceFile(directory_ / "analytics.toml", "used = [" + patterns_ + "]\n"); }
 
+    ledger::Ledger ledger_;
     std::string patterns_;
     platform::ConfigurationWatcher watcher_{directory_.path(), platform::ProviderLog(log_)};
     std::optional<platform::AnalyticsStore> store_;

@@ -173,7 +173,8 @@ public:
         queue_ = queues_.makeTurnQueue("server", {.mayBeHelped = true});
         // Both ends of every connection are in this process, so its limit stays unchanged.
         listener_ =
-            platform::LinuxConnectionListener::create(platform::ListeningSocket::bind(path_).value(), log_).value();
+            platform::LinuxConnectionListener::create(platform::ListeningSocket::bind(path_).value(), ledger_, log_)
+                .value();
     }
     ~LinuxConnectionSubject() override { stop(); }
     LinuxConnectionSubject(const LinuxConnectionSubject&) = delete;
@@ -202,6 +203,7 @@ private:
     const std::filesystem::path path_ = directory_ / "socket";
     platform::LinuxWorkQueues queues_;
     std::shared_ptr<platform::TurnQueue> queue_;
+    ledger::Ledger ledger_;
     std::unique_ptr<platform::LinuxConnectionListener> listener_;
     std::thread thread_;
 };

@@ -15,7 +15,7 @@ namespace contract {
 namespace {
 
 using foundation::Dictionary;
-using platform::StoreError;
+using ledger::Counter;
 using testing::ElementsAre;
 using testing::IsEmpty;
 
@@ -87,16 +87,17 @@ protected:
     void add(Dictionary payload) { batch.add(subject->clock.secondsSince1970(), "com.quarn.a", payload); }
     void keep()
     {
-        subject->keeper().keep(batch);
+        subject->keeper().keep(batch, tally);
         batch.clear();
     }
     void tidy()
     {
-        while (subject->keeper().tidy(true)) { }
+        while (subject->keeper().tidy(true, tally)) { }
     }
 
     platform::AnalyticsConfiguration configuration;
     platform::EventBatch batch;
+    ledger::Tally tally;
 };
 KESTO_CONTRACT(EventKeeperContract, (provider<EventKeeperSubject, MemoryKeeperSubject>("Memory")),
                (provider<EventKeeperSubject, SqliteKeeperSubject>("Sqlite")));
@@ -104,7 +105,7 @@ KESTO_CONTRACT(EventKeeperContract, (provider<EventKeeperSubject, MemoryKeeperSu
 TEST_P(EventKeeperContract, IsThereAndEmptyOnceItIsOpen)
 {
     EXPECT_THAT(subject->payloads(), IsEmpty());
-    EXPECT_EQ(subject->keeper().keptEvents(), 0U);
+    EXPECT_EQ(tally[Counter::Kept], 0U);
 }
 
 TEST_P(EventKeeperContract, KeepsBatchesInTheirOrderWhenItReturns)
@@ -116,7 +117,7 @@ TEST_P(EventKeeperContract, KeepsBatchesInTheirOrderWhenItReturns)
     add({{"n", 3}});
     keep();
     EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":1}", "{\"n\":2}", "{\"n\":3}"));
-    EXPECT_EQ(subject->keeper().keptEvents(), 3U);
+    EXPECT_EQ(tally[Counter::Kept], 3U);
 }
 
 TEST_P(EventKeeperContract, KeepsWhatItKeptWhenItIsClosedAndOpenedAgain)
@@ -137,9 +138,9 @@ TEST_P(EventKeeperContract, LosesOnlyAnEventThatJsonCannotSayAndCountsIt)
     add({{"n", 2}});
     keep();
     EXPECT_THAT(subject->payloads(), ElementsAre("{\"n\":1}", "{\"n\":2}"));
-    EXPECT_EQ(subject->keeper().keptEvents(), 2U);
-    EXPECT_EQ(subject->keeper().lostEvents(StoreError::NotJson), 1U);
-    EXPECT_EQ(subject->keeper().lostEvents(StoreError::DiskFull), 0U);
+    EXPECT_EQ(tally[Counter::Kept], 2U);
+    EXPECT_EQ(tally[Counter::LostNotJson], 1U);
+    EXPECT_EQ(tally[Counter::LostToDiskFull], 0U);
 }
 
 TEST_P(EventKeeperContract, RemovesWhatIsTooOld)

@@ -23,7 +23,11 @@ public:
     static constexpr std::size_t mostUnansweredCalls = 32 * 1024;
     static constexpr std::size_t mostUnansweredBytes = 1024 * 1024;
 
-    explicit FakeConnection(std::int32_t processIdentifier) : processIdentifier_(processIdentifier) { }
+    explicit FakeConnection(std::int32_t processIdentifier, std::uint32_t userIdentifier = 0)
+        : processIdentifier_(processIdentifier),
+          userIdentifier_(userIdentifier)
+    {
+    }
 
     // The peer makes one call. It is delivered immediately unless too many calls are unanswered; then later, with the
     // next call or with `readOn`. After a violation the connection breaks.
@@ -48,6 +52,7 @@ public:
     [[nodiscard]] bool isOver() const { return isOver_; }
 
     [[nodiscard]] std::int32_t processIdentifier() const override { return processIdentifier_; }
+    [[nodiscard]] std::uint32_t userIdentifier() const override { return userIdentifier_; }
     [[nodiscard]] std::string description() const override;
     void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
@@ -66,6 +71,7 @@ private:
     void deliverWhatIsLeft();
 
     const std::int32_t processIdentifier_;
+    const std::uint32_t userIdentifier_;
     CallHandler callHandler_;
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;

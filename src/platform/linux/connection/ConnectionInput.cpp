@@ -2,25 +2,24 @@
 #include "platform/linux/connection/ConnectionInput.h"
 
 #include <fmt/format.h>
-#include <string>
 #include <utility>
 
 namespace platform {
 
-std::expected<std::optional<ConnectionInput::Frame>, Connection::Violation> ConnectionInput::next()
+std::expected<std::optional<ConnectionInput::Frame>, ConnectionInput::Refusal> ConnectionInput::next()
 {
-    using Violation = Connection::Violation;
+    using enum ledger::Counter;
     const auto frame = reader_.next();
     if (!frame)
-        return std::unexpected(Violation{fmt::format("a frame is longer than {} bytes", longestFrame)});
+        return std::unexpected(Refusal{fmt::format("a frame is longer than {} bytes", longestFrame), FramesTooLong});
     if (!*frame)
         return std::nullopt;
     const auto value = decoder_.decode(**frame);
     if (!value)
-        return std::unexpected(Violation{std::string(foundation::description(value.error()))});
+        return std::unexpected(Refusal{std::string(foundation::description(value.error())), FramesNotCbor});
     auto array = value->array();
     if (!array)
-        return std::unexpected(Violation{"a frame is not an array"});
+        return std::unexpected(Refusal{"a frame is not an array", FramesNotCbor});
     return Frame{*std::move(array), (*frame)->size()};
 }
 

@@ -3,12 +3,13 @@
 
 #include "foundation/cbor/Cbor.h"
 #include "foundation/values/Value.h"
-#include "platform/Connection.h"
+#include "ledger/Counter.h"
 #include "platform/linux/connection/FrameReader.h"
 
 #include <cstddef>
 #include <expected>
 #include <optional>
+#include <string>
 #include <string_view>
 
 namespace platform {
@@ -21,10 +22,16 @@ public:
         std::size_t size; // of its encoding
     };
 
+    // What is wrong with a frame, and where it is counted.
+    struct Refusal {
+        std::string reason;
+        ledger::Counter counter;
+    };
+
     // The bytes must stay valid until all their frames were taken.
     void feed(std::string_view bytes) { reader_.feed(bytes); }
-    // The next frame, or nothing until it is complete. On an error, what is wrong with it; the input then ends.
-    [[nodiscard]] std::expected<std::optional<Frame>, Connection::Violation> next();
+    // The next frame, or nothing until it is complete. After a refusal the input ends.
+    [[nodiscard]] std::expected<std::optional<Frame>, Refusal> next();
     // Whether only a part of a frame has come.
     [[nodiscard]] bool isInsideFrame() const { return reader_.isInsideFrame(); }
 

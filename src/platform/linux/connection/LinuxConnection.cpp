@@ -13,6 +13,9 @@
 #include <utility>
 
 namespace platform {
+
+using ledger::Counter;
+
 namespace {
 
 // Both counts in one number, so that exactly one thread sees them fall below the limits.
@@ -133,10 +136,12 @@ void LinuxConnection::read()
 
 void LinuxConnection::endOfStream()
 {
-    if (input_.isInsideFrame())
-        breakOff("the stream ends inside a frame");
-    else
+    if (!input_.isInsideFrame()) {
         peerIsDone_ = true;
+        return;
+    }
+    hub_->ledger.count(Counter::FramesCutOff);
+    breakOff("the stream ends inside a frame");
 }
 
 // Decodes all frames before it delivers the first call: deliveries in quick succession wake the queue only once, which
@@ -156,14 +161,18 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
 {
     while (true) {
         auto frame = input_.next();
-        if (!frame)
-            return std::unexpected(std::move(frame).error());
+        if (!frame) {
+            hub_->ledger.count(frame.error().counter);
+            return std::unexpected(Violation{std::move(frame).error().reason});
+        }
         if (!*frame)
             return {};
         auto& [array, size] = **frame;
         if (asksForEmitterAccess(array)) {
-            if (auto asked = askForEmitterAccess(array[0]); !asked)
+            if (auto asked = askForEmitterAccess(array[0]); !asked) {
+                hub_->ledger.count(Counter::FramesNotACall);
                 return asked;
+            }
             continue;
         }
         unanswered_.fetch_add(unansweredCall(size));
@@ -182,6 +191,8 @@ std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
             break;
     }
     hub_->calls.clear();
+    if (!result)
+        hub_->ledger.count(Counter::FramesNotACall);
     return result;
 }
 
@@ -194,6 +205,7 @@ std::expected<void, Connection::Violation> LinuxConnection::askForEmitterAccess(
         return std::unexpected(Violation{"a call's number is an unsigned 64-bit integer"});
     if (std::exchange(hasAskedForEmitterAccess_, true))
         return std::unexpected(Violation{"it asks for the trace marker twice"});
+    hub_->ledger.count(Counter::CallsTrace);
     if (hub_->emitterAccess != nullptr)
         hub_->emitterAccess->ask(this,
                                  [weak = weak_from_this(), number = *number](const EmitterDescriptors& descriptors) {
@@ -272,9 +284,11 @@ void LinuxConnection::writeOutput()
 
 void LinuxConnection::drop(std::size_t bytes)
 {
+    if (bytes == 0)
+        return;
     unsentBytes_ -= bytes;
     droppedBytes_ += bytes;
-    hub_->counters.droppedBytes += bytes;
+    hub_->ledger.count(Counter::AnswerBytesDropped, bytes);
 }
 
 bool LinuxConnection::isBehind() const noexcept
@@ -298,7 +312,7 @@ void LinuxConnection::watch()
         return;
     if ((watchedEvents_ & ~event.events & EPOLLIN) != 0) {
         ++readingPauses_;
-        ++hub_->counters.readingPauses;
+        hub_->ledger.count(Counter::ReadingPauses);
     }
     watchedEvents_ = event.events;
     event.data.ptr = this;
@@ -335,8 +349,8 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
     if (readingPauses != 0 || droppedBytes_ != 0)
         KESTO_LOG(hub_->log, Default, "{} was behind: reading paused {} times, {} bytes of answers were dropped",
                   description(), readingPauses, droppedBytes_.load());
+    hub_->ledger.count(interruptedBecause ? Counter::ConnectionsInterrupted : Counter::ConnectionsEnded);
     if (interruptedBecause) {
-        ++hub_->counters.interrupted;
         KESTO_LOG(hub_->log, Default, "{} ends: {}", description(), *interruptedBecause);
         if (interruptionHandler_)
             interruptionHandler_();

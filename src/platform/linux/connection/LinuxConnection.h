@@ -46,7 +46,7 @@ public:
     LinuxConnection(std::shared_ptr<ConnectionHub> hub, FileDescriptor socket, Peer peer);
 
     [[nodiscard]] std::int32_t processIdentifier() const override { return peer_.processIdentifier; }
-    [[nodiscard]] std::uint32_t userIdentifier() const { return peer_.userIdentifier; }
+    [[nodiscard]] std::uint32_t userIdentifier() const override { return peer_.userIdentifier; }
     [[nodiscard]] std::string description() const override;
     void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }

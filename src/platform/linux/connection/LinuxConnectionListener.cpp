@@ -34,7 +34,7 @@ std::size_t mostConnections()
 } // namespace
 
 std::expected<std::unique_ptr<LinuxConnectionListener>, std::error_code>
-LinuxConnectionListener::create(ListeningSocket socket, LogCategory& log)
+LinuxConnectionListener::create(ListeningSocket socket, ledger::Ledger& ledger, LogCategory& log)
 {
     FileDescriptor epoll(::epoll_create1(EPOLL_CLOEXEC));
     if (!epoll)
@@ -43,7 +43,7 @@ LinuxConnectionListener::create(ListeningSocket socket, LogCategory& log)
     if (!wake)
         return std::unexpected(systemError());
     std::unique_ptr<LinuxConnectionListener> listener(
-        new LinuxConnectionListener(std::move(socket), std::move(epoll), std::move(wake), log));
+        new LinuxConnectionListener(std::move(socket), std::move(epoll), std::move(wake), ledger, log));
     if (!listener->watch(EPOLL_CTL_ADD, listener->wake_.get(), EPOLLIN | EPOLLET, &listener->wake_)
         || !listener->watch(EPOLL_CTL_ADD, listener->socket_.descriptor(), 0, &listener->socket_))
         return std::unexpected(systemError());
@@ -51,10 +51,10 @@ LinuxConnectionListener::create(ListeningSocket socket, LogCategory& log)
 }
 
 LinuxConnectionListener::LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake,
-                                                 LogCategory& log)
+                                                 ledger::Ledger& ledger, LogCategory& log)
     : socket_(std::move(socket)),
       wake_(std::move(wake)),
-      hub_(std::make_shared<ConnectionHub>(std::move(epoll), log)),
+      hub_(std::make_shared<ConnectionHub>(std::move(epoll), log, ledger)),
       mostConnections_(mostConnections()),
       mostConnectionsOfAUser_(mostConnections_ - mostConnections_ / partForOthers)
 {
@@ -159,7 +159,7 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
         return; // it has gone already
     User& user = users_[peer.uid];
     if (user.connections == mostConnectionsOfAUser_) {
-        ++hub_->counters.refused;
+        hub_->ledger.count(ledger::Counter::ConnectionsRefused);
         if (!std::exchange(user.refusalIsLogged, true))
             KESTO_LOG(hub_->log, Error, "user {} has {} connections and gets no more until one ends", peer.uid,
                       user.connections);
@@ -169,7 +169,7 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     const auto connection =
         std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid});
     connections_.emplace(connection.get(), connection);
-    ++hub_->counters.accepted;
+    hub_->ledger.count(ledger::Counter::ConnectionsAccepted);
     if (!delegate_->shouldAcceptNewConnection(*this, connection))
         connection->invalidate();
     handle(*connection, 0); // it may be over already
@@ -190,7 +190,7 @@ void LinuxConnectionListener::pauseAccepting(std::optional<Clock::duration> paus
     isAccepting_ = !watch(EPOLL_CTL_MOD, socket_.descriptor(), 0, &socket_);
     if (pause)
         acceptAgainAt_ = Clock::now() + *pause;
-    ++hub_->counters.acceptingPauses;
+    hub_->ledger.count(ledger::Counter::AcceptingPauses);
     if (!std::exchange(pauseIsLogged_, true))
         KESTO_LOG(hub_->log, Error, "new connections have to wait, with {} open: {}", connections_.size(),
                   systemErrorText(error));

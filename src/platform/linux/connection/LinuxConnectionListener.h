@@ -39,9 +39,10 @@ public:
     // How long clients wait if the system has no descriptor for them.
     static constexpr std::chrono::milliseconds acceptingPause{1000};
 
-    // The category gets a line for every connection that breaks. Fails if the system has no descriptors left.
+    // The ledger counts the connections, and the category gets a line for each that breaks. Fails if the system has no
+    // descriptors left.
     [[nodiscard]] static std::expected<std::unique_ptr<LinuxConnectionListener>, std::error_code>
-    create(ListeningSocket socket, LogCategory& log);
+    create(ListeningSocket socket, ledger::Ledger& ledger, LogCategory& log);
 
     void setDelegate(ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
     // Gives the trace's marker and switch page to clients that ask. Call this before `resume`.
@@ -52,9 +53,6 @@ public:
     // Makes `resume` end all connections and return. Any thread.
     void stop() override;
 
-    // Any thread.
-    [[nodiscard]] const ConnectionCounters& counters() const noexcept { return hub_->counters; }
-
 private:
     using Clock = std::chrono::steady_clock;
 
@@ -64,7 +62,8 @@ private:
         bool refusalIsLogged = false; // since one of the connections ended
     };
 
-    LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake, LogCategory& log);
+    LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake, ledger::Ledger& ledger,
+                            LogCategory& log);
 
     [[nodiscard]] bool watch(int operation, int descriptor, std::uint32_t events, void* tag);
     void serve();

@@ -8,6 +8,8 @@
 
 namespace platform {
 
+using ledger::Counter;
+
 namespace {
 constexpr std::size_t mostRoomKept = 1024; // in waiting turns; further room of a burst is freed
 }
@@ -17,6 +19,7 @@ constexpr std::size_t mostRoomKept = 1024; // in waiting turns; further room of 
 void AnalyticsStore::Batch::clear()
 {
     events.clear();
+    tally.clear();
     whenKept.clear();
     if (whenKept.capacity() > mostRoomKept)
         whenKept = std::vector<WhenKept>();
@@ -30,11 +33,13 @@ bool AnalyticsStore::isRoomBeside(const EventBatch& events, std::size_t waiters)
 // --- For callers
 
 AnalyticsStore::AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
-                               ProviderLog log, Limits limits)
+                               ledger::Ledger& ledger, ProviderLog log, Limits limits)
     : clock_(clock),
+      ledger_(ledger),
       log_(log),
       limits_(limits),
       keeper_(std::move(keeper)),
+      storedByLedger_(ledger.account().stored()),
       configurationFile_(watcher, "analytics.toml", log, [this] { applyConfiguration(); })
 {
     applyConfiguration();
@@ -53,26 +58,33 @@ AnalyticsStore::~AnalyticsStore()
 
 void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder)
 {
+    turn.tally.add(Counter::Events);
     if (!isAnalyticsEventUsed(eventName)) // most callers have asked already, and then this costs little
-        return;
+        return turn.tally.add(Counter::Unwanted);
     const double time = clock_.secondsSince1970();
     turn.events.add(time, eventName, payloadBuilder());
     if (isRoomBeside(turn.events, 0))
         return;
     const foundation::Lock lock(lock_);
     waiting_.events.takeFrom(turn.events); // a turn that is too large is written in parts
+    waiting_.tally.takeFrom(turn.tally);
     wakeKeeper();
     waitForRoom();
 }
 
 void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder)
 {
-    if (!isAnalyticsEventUsed(eventName))
-        return;
+    ledger::Tally tally;
+    tally.add(Counter::Events);
+    if (!isAnalyticsEventUsed(eventName)) {
+        tally.add(Counter::Unwanted);
+        return ledger_.post(tally);
+    }
     const double time = clock_.secondsSince1970();
     const foundation::Dictionary payload = payloadBuilder();
     const foundation::Lock lock(lock_);
     waiting_.events.add(time, eventName, payload);
+    waiting_.tally.takeFrom(tally);
     wakeKeeper();
     waitForRoom();
 }
@@ -83,6 +95,7 @@ void AnalyticsStore::endTurn(Turn& turn, WhenKept whenKept)
         const foundation::Lock lock(lock_);
         if (turn.events.size() != 0 || !isEverythingKept()) {
             waiting_.events.takeFrom(turn.events);
+            waiting_.tally.takeFrom(turn.tally);
             if (whenKept)
                 waiting_.whenKept.push_back(std::move(whenKept));
             wakeKeeper();
@@ -90,6 +103,8 @@ void AnalyticsStore::endTurn(Turn& turn, WhenKept whenKept)
             return;
         }
     }
+    ledger_.post(turn.tally);
+    turn.tally.clear();
     if (whenKept)
         whenKept();
 }
@@ -151,13 +166,49 @@ void AnalyticsStore::run()
         if (isFirst)
             keeper_->open();
         const bool isQuiet = batch.empty();
-        keeper_->keep(batch.events);
+        keeper_->keep(batch.events, batch.tally);
+        post(batch.tally); // before the answers leave: what is acknowledged is counted
         for (WhenKept& whenKept : batch.whenKept)
             whenKept();
         finish();
         batch.clear();
-        while (keeper_->tidy(isQuiet) && isIdle()) { }
+        while (tidy(isQuiet) && isIdle()) { }
     }
+}
+
+// True if more is left to do.
+bool AnalyticsStore::tidy(bool isQuiet)
+{
+    ledger::Tally tally;
+    const bool hasMore = keeper_->tidy(isQuiet, tally);
+    post(tally);
+    return hasMore;
+}
+
+void AnalyticsStore::post(ledger::Tally& tally)
+{
+    const auto state = keeper_->state();
+    if (state)
+        settle(tally, state->events);
+    ledger_.post(tally, state);
+}
+
+// The keeper's place may hold other events than the ledger counted: those that were committed when the service was
+// killed before it counted them, those of a place that was made before there was a ledger, or fewer, if the place was
+// damaged, removed or replaced.
+void AnalyticsStore::settle(ledger::Tally& tally, std::uint64_t stored)
+{
+    storedByLedger_ += tally[Counter::Kept];
+    for (const ledger::CounterRow& row : ledger::counterRows())
+        if (ledger::chargeOf(row.counter) == ledger::Charge::Removed)
+            storedByLedger_ -= tally[row.counter];
+    if (stored > storedByLedger_) {
+        tally.add(Counter::Events, stored - storedByLedger_);
+        tally.add(Counter::Kept, stored - storedByLedger_);
+    } else if (stored < storedByLedger_) {
+        tally.add(Counter::RemovedByDamage, storedByLedger_ - stored);
+    }
+    storedByLedger_ = stored;
 }
 
 // Waits for events, callbacks or a new configuration, or for a quiet moment, and takes all of them. False at the end.

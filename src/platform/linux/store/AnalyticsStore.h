@@ -10,6 +10,7 @@
 #pragma once
 
 #include "foundation/Mutex.h"
+#include "ledger/Ledger.h"
 #include "platform/Analytics.h"
 #include "platform/Clock.h"
 #include "platform/linux/settings/ConfigurationWatcher.h"
@@ -47,10 +48,10 @@ public:
     // Hands events to the keeper. analytics.toml in the configuration directory says which events the store keeps, and
     // for how long.
     AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
-                   ProviderLog log, Limits limits);
+                   ledger::Ledger& ledger, ProviderLog log, Limits limits);
     AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
-                   ProviderLog log)
-        : AnalyticsStore(std::move(keeper), watcher, clock, log, Limits())
+                   ledger::Ledger& ledger, ProviderLog log)
+        : AnalyticsStore(std::move(keeper), watcher, clock, ledger, log, Limits())
     {
     }
     // Writes everything that was sent, except for turns that have not ended.
@@ -63,26 +64,23 @@ public:
     void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
     void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
 
-    // Takes the events of a turn. Calls `whenKept`, unless it is empty, once everything taken so far is committed or
-    // counted as lost: before it returns if that is so already, otherwise later on the store's thread. The calls come
-    // in the order of the turns, one at a time. `whenKept` must not use the store. Blocks only while too much waits to
-    // be written.
+    // Takes the events and the counts of a turn. Calls `whenKept`, unless it is empty, once everything taken so far is
+    // committed or counted as lost: before it returns if that is so already, otherwise later on the store's thread. The
+    // calls come in the order of the turns, one at a time. `whenKept` must not use the store. Blocks only while too
+    // much waits to be written.
     void endTurn(Turn& turn, WhenKept whenKept);
 
     // Returns when everything taken so far is committed or counted as lost.
     void flush();
 
-    // Since the start.
-    [[nodiscard]] std::uint64_t keptEvents() const noexcept { return keeper_->keptEvents(); }
-    [[nodiscard]] std::uint64_t lostEvents(StoreError reason) const noexcept { return keeper_->lostEvents(reason); }
-
 private:
-    // Events, and the callbacks that wait for them.
+    // Events, their counts, and the callbacks that wait for them.
     struct Batch {
         EventBatch events;
+        ledger::Tally tally;
         std::vector<WhenKept> whenKept;
 
-        [[nodiscard]] bool empty() const noexcept { return events.size() == 0 && whenKept.empty(); }
+        [[nodiscard]] bool empty() const noexcept { return events.size() == 0 && tally.empty() && whenKept.empty(); }
         void clear();
     };
 
@@ -95,15 +93,20 @@ private:
     // Only for the store's thread.
     void run();
     [[nodiscard]] bool take(Batch& batch);
+    [[nodiscard]] bool tidy(bool isQuiet);
+    void post(ledger::Tally& tally);
+    void settle(ledger::Tally& tally, std::uint64_t stored);
     [[nodiscard]] bool sleep() KESTO_REQUIRES(lock_);
     void finish();
     [[nodiscard]] bool isIdle();
 
     const Clock& clock_;
+    ledger::Ledger& ledger_;
     const ProviderLog log_;
     const Limits limits_;
     UsedEventNames names_;
-    const std::unique_ptr<EventKeeper> keeper_; // only for the store's thread
+    const std::unique_ptr<EventKeeper> keeper_; // only for the store's thread, as the next
+    std::uint64_t storedByLedger_; // the events that are in the store according to the ledger
 
     foundation::Mutex lock_;
     foundation::Condition changed_; // the store's thread has work

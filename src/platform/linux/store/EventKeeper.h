@@ -5,17 +5,18 @@
 // Another engine needs one file that implements this, and the line in LinuxPlatform that makes it.
 #pragma once
 
+#include "ledger/LedgerImage.h"
+#include "ledger/Tally.h"
 #include "platform/EventBatch.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
-#include "platform/linux/store/StoreError.h"
 
-#include <cstdint>
+#include <optional>
 
 namespace platform {
 
-// The store's thread calls its functions; any thread reads the counts. The keeper is made on the thread that makes the
-// store, before the first call, and destroyed on the thread that destroys the store, after the last. It logs and counts
-// its own failures.
+// The store's thread calls its functions. The keeper is made on the thread that makes the store, before the first call,
+// and destroyed on the thread that destroys the store, after the last. It logs its own failures, and counts in the
+// tally that it gets: events kept, lost and removed.
 class EventKeeper {
 public:
     EventKeeper() = default;
@@ -31,16 +32,14 @@ public:
     // Keeps all the events, in their order, or none. When it returns, they are kept or counted as lost. A payload that
     // JSON cannot express is lost alone. The batch may be empty: when the store is quiet, when a configuration changed,
     // and when only callers wait.
-    virtual void keep(EventBatch& events) = 0;
+    virtual void keep(EventBatch& events, ledger::Tally& tally) = 0;
     // Whether some tidying waits until the store is quiet.
     [[nodiscard]] virtual bool awaitsQuiet() const = 0;
     // Does a part of the tidying that is due: removes events that are too old or too many. True if more is left to do.
     // `isQuiet`: no events wait now.
-    virtual bool tidy(bool isQuiet) = 0;
-
-    // The number of events kept since the start, and of those lost for that reason. Any thread.
-    [[nodiscard]] virtual std::uint64_t keptEvents() const noexcept = 0;
-    [[nodiscard]] virtual std::uint64_t lostEvents(StoreError reason) const noexcept = 0;
+    virtual bool tidy(bool isQuiet, ledger::Tally& tally) = 0;
+    // What the place holds now; nothing while it is not open.
+    [[nodiscard]] virtual std::optional<ledger::StoreState> state() const = 0;
 };
 
 } // namespace platform

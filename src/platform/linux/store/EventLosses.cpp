@@ -28,7 +28,7 @@ void EventLosses::report()
 
 void EventLosses::log(StoreError reason, Loss& loss)
 {
-    const auto [problem, remedy] = words(reason);
+    const auto& [counter, path, meaning, problem, remedy] = row(counterOf(reason));
     const std::uint64_t events = loss.events;
     log_.error("{} analytics events were lost ({} since the start): {}: {}; {}", events - loss.reported, events,
                path_.native(), problem, remedy);

@@ -1,4 +1,4 @@
-// Counts the events that could not be kept, by reason, and logs them: at the first loss of a kind, and then once a
+// Logs the events that could not be kept, by reason: at the first loss of a kind, and then once a
 // minute while losses go on, so that a full disk does not also fill the log.
 #pragma once
 
@@ -7,13 +7,12 @@
 #include "platform/linux/store/StoreError.h"
 
 #include <array>
-#include <atomic>
 #include <cstdint>
 #include <filesystem>
 
 namespace platform {
 
-// One thread, except for `count`.
+// One thread.
 class EventLosses {
 public:
     static constexpr double secondsBetweenLines = 60;
@@ -34,15 +33,9 @@ public:
     // Reports new losses, except for reasons that were reported within the last minute.
     void report();
 
-    // The number of events lost for that reason since the start. Any thread.
-    [[nodiscard]] std::uint64_t count(StoreError reason) const noexcept
-    {
-        return losses_[static_cast<std::size_t>(reason)].events;
-    }
-
 private:
     struct Loss {
-        std::atomic<std::uint64_t> events = 0;
+        std::uint64_t events = 0;
         std::uint64_t reported = 0;
         double reportedAt = 0; // the time of the last report (uptime, in seconds)
     };

@@ -79,7 +79,7 @@ SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>> SqliteEventFile::ope
     std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path));
     for (const auto step :
          {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::checkOrMakeSchema,
-          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements})
+          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::countEvents})
         if (const auto done = (*database.*step)(); !done)
             return std::unexpected(done.error());
     return database;
@@ -196,6 +196,15 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
     return {};
 }
 
+SqliteEventFile::Expected<> SqliteEventFile::countEvents()
+{
+    const auto count = number("SELECT count(*) FROM events");
+    if (!count)
+        return std::unexpected(count.error());
+    eventsAtOpening_ = static_cast<std::uint64_t>(*count);
+    return {};
+}
+
 bool SqliteEventFile::wasReplaced() const
 {
     struct stat status = {};
@@ -264,6 +273,14 @@ bool SqliteEventFile::emptyLog(std::chrono::milliseconds wait)
     if (done == SQLITE_OK)
         logPages_ = 0;
     return done == SQLITE_OK;
+}
+
+SqliteEventFile::Expected<double> SqliteEventFile::oldest()
+{
+    const auto statement = prepare("SELECT time FROM events ORDER BY id LIMIT 1");
+    if (!statement)
+        return std::unexpected(statement.error());
+    return ::sqlite3_step(statement->get()) == SQLITE_ROW ? ::sqlite3_column_double(statement->get(), 0) : 0;
 }
 
 SqliteEventFile::Expected<SqliteEventFile::Size> SqliteEventFile::size()

@@ -60,6 +60,10 @@ public:
     // starts it again. False also after an error of the disk: a log can be moved later.
     [[nodiscard]] bool emptyLog(std::chrono::milliseconds wait = {});
 
+    // The events that were in the file when it was opened.
+    [[nodiscard]] std::uint64_t eventsAtOpening() const noexcept { return eventsAtOpening_; }
+    // The time of the first event; 0 without events.
+    [[nodiscard]] Expected<double> oldest();
     struct Size {
         std::uint64_t usedBytes = 0;
         std::uint64_t freeBytes = 0; // room in the file that no event uses
@@ -88,6 +92,7 @@ private:
     [[nodiscard]] Expected<> configure();
     [[nodiscard]] Expected<> beginLog();
     [[nodiscard]] Expected<> prepareStatements();
+    [[nodiscard]] Expected<> countEvents();
 
     [[nodiscard]] StoreError lastError() const;
     [[nodiscard]] Expected<> execute(const char* sql);
@@ -104,6 +109,7 @@ private:
     std::uint64_t device_ = 0; // with the inode, identifies the file under any name
     std::uint64_t inode_ = 0;
     std::uint64_t pageSize_ = 0;
+    std::uint64_t eventsAtOpening_ = 0;
     std::uint64_t logPages_ = 0;
     Statement begin_;
     Statement commit_;

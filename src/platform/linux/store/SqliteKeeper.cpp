@@ -58,7 +58,7 @@ std::uint64_t SqliteKeeper::maximumBytes() const noexcept
 void SqliteKeeper::open()
 {
     if (const auto done = ensureOpen(); !done) {
-        const auto [problem, remedy] = words(done.error());
+        const auto& [counter, path, meaning, problem, remedy] = row(counterOf(done.error()));
         log_.error("analytics events cannot be kept: {}: {}; {}", path_.native(), problem, remedy);
     }
 }
@@ -91,6 +91,8 @@ SqliteKeeper::Expected<> SqliteKeeper::openAnew()
     if (!opened)
         return std::unexpected(opened.error());
     database_ = std::move(*opened);
+    state_ = {.events = database_->eventsAtOpening(), .bytes = 0, .oldest = 0};
+    hasMoreToTidy_ = true; // which also completes the state
     logBytesAtCheckpoint_ = 0;
     return database_->setSynchronization(configuration_.synchronization);
 }
@@ -142,20 +144,33 @@ void SqliteKeeper::removeOldestDamaged()
 
 // --- Keeping
 
-void SqliteKeeper::keep(EventBatch& events)
+void SqliteKeeper::keep(EventBatch& events, ledger::Tally& tally)
 {
     if (events.size() == 0)
         return;
     const auto rows = events.rows();
-    losses_.add(StoreError::NotJson, events.size() - rows.size());
+    lose(StoreError::NotJson, events.size() - rows.size(), tally);
     auto done = write(rows);
     if (!done && done.error() == StoreError::Corrupt)
         done = write(rows); // now into a new database
-    if (done)
-        kept_ += rows.size();
-    else
-        losses_.add(done.error(), rows.size());
+    if (done) {
+        tally.add(ledger::Counter::Kept, rows.size());
+        state_.events += rows.size();
+    } else {
+        lose(done.error(), rows.size(), tally);
+    }
     losses_.report();
+}
+
+void SqliteKeeper::lose(StoreError reason, std::uint64_t events, ledger::Tally& tally)
+{
+    losses_.add(reason, events);
+    tally.add(counterOf(reason), events);
+}
+
+std::optional<ledger::StoreState> SqliteKeeper::state() const
+{
+    return database_ ? std::optional(state_) : std::nullopt;
 }
 
 SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows)
@@ -200,7 +215,7 @@ bool SqliteKeeper::awaitsQuiet() const
     return database_ && isLogLongerBy(logBytesBetweenCheckpoints);
 }
 
-bool SqliteKeeper::tidy(bool isQuiet)
+bool SqliteKeeper::tidy(bool isQuiet, ledger::Tally& tally)
 {
     losses_.report();
     if (!database_)
@@ -211,7 +226,8 @@ bool SqliteKeeper::tidy(bool isQuiet)
         emptyLog();
     const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
         || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
-    hasMoreToTidy_ = isDue && database_->logBytes() <= maximumBytes() && makeRoom(); // deleting makes the log longer
+    hasMoreToTidy_ =
+        isDue && database_->logBytes() <= maximumBytes() && makeRoom(tally); // deleting makes the log longer
     return hasMoreToTidy_;
 }
 
@@ -234,7 +250,7 @@ bool SqliteKeeper::emptyLog()
 
 // Frees more room than events have taken since the last call, so that it keeps up, but only a part of all that is due.
 // True if more is left to do.
-bool SqliteKeeper::makeRoom()
+bool SqliteKeeper::makeRoom(ledger::Tally& tally)
 {
     const std::uint64_t mostFreed = 2 * std::exchange(bytesSinceCheck_, 0) + bytesTidiedAtOnce;
     checkedAt_ = clock_.systemUptime();
@@ -243,7 +259,8 @@ bool SqliteKeeper::makeRoom()
     auto size = database_->size();
     const std::uint64_t roomBefore = size ? room(*size) : 0;
     while (size && room(*size) + mostFreed > roomBefore) {
-        const auto hasMore = makeSomeRoom(*size);
+        state_.bytes = size->usedBytes + size->freeBytes + database_->logBytes();
+        const auto hasMore = makeSomeRoom(*size, tally);
         if (hasMore && !*hasMore)
             return false;
         size = hasMore ? database_->size() : std::unexpected(hasMore.error());
@@ -254,14 +271,17 @@ bool SqliteKeeper::makeRoom()
 }
 
 // False if nothing is left to do.
-SqliteKeeper::Expected<bool> SqliteKeeper::makeSomeRoom(const SqliteEventFile::Size& size)
+SqliteKeeper::Expected<bool> SqliteKeeper::makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally)
 {
     const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
-    const auto deleted = size.usedBytes > maximumBytes()
-        ? database_->deleteOldest(size.usedBytes - maximumBytes(), eventsDeletedAtOnce)
-        : database_->deleteBefore(tooOld, eventsDeletedAtOnce);
+    const bool isTooLarge = size.usedBytes > maximumBytes();
+    const auto deleted = isTooLarge ? database_->deleteOldest(size.usedBytes - maximumBytes(), eventsDeletedAtOnce)
+                                    : database_->deleteBefore(tooOld, eventsDeletedAtOnce);
     if (!deleted)
         return std::unexpected(deleted.error());
+    tally.add(isTooLarge ? ledger::Counter::RemovedForSize : ledger::Counter::RemovedForAge, *deleted);
+    state_.events -= *deleted;
+    state_.oldest = database_->oldest().value_or(0);
     // New events fill the room of deleted ones; the file shrinks only if far too much of it is free.
     const bool isFileTooLarge = size.usedBytes + size.freeBytes > maximumBytes() + maximumBytes() / 8;
     if (*deleted > 0 || !isFileTooLarge || size.freeBytes == 0)

@@ -8,7 +8,6 @@
 #include "platform/linux/store/EventLosses.h"
 #include "platform/linux/store/SqliteEventFile.h"
 
-#include <atomic>
 #include <cstdint>
 #include <filesystem>
 #include <memory>
@@ -17,7 +16,7 @@
 
 namespace platform {
 
-// One thread, except for the counts.
+// One thread.
 class SqliteKeeper final : public EventKeeper {
 public:
     static constexpr std::string_view fileName = "analytics.sqlite3";
@@ -44,12 +43,10 @@ public:
     void setConfiguration(const AnalyticsConfiguration& configuration) override;
 
     void open() override;
-    void keep(EventBatch& events) override; // in one transaction
+    void keep(EventBatch& events, ledger::Tally& tally) override; // in one transaction
     [[nodiscard]] bool awaitsQuiet() const override;
-    bool tidy(bool isQuiet) override;
-
-    [[nodiscard]] std::uint64_t keptEvents() const noexcept override { return kept_; }
-    [[nodiscard]] std::uint64_t lostEvents(StoreError reason) const noexcept override { return losses_.count(reason); }
+    bool tidy(bool isQuiet, ledger::Tally& tally) override;
+    [[nodiscard]] std::optional<ledger::StoreState> state() const override;
 
 private:
     template <typename Result = void> using Expected = SqliteEventFile::Expected<Result>;
@@ -60,10 +57,11 @@ private:
     void removeOldestDamaged();
     [[nodiscard]] Expected<> write(std::span<const EventRow> rows);
     void handleFailure(StoreError error);
+    void lose(StoreError reason, std::uint64_t events, ledger::Tally& tally);
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     bool emptyLog();
-    [[nodiscard]] bool makeRoom();
-    [[nodiscard]] Expected<bool> makeSomeRoom(const SqliteEventFile::Size& size);
+    [[nodiscard]] bool makeRoom(ledger::Tally& tally);
+    [[nodiscard]] Expected<bool> makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally);
     [[nodiscard]] std::uint64_t maximumBytes() const noexcept;
 
     const std::filesystem::path path_;
@@ -71,9 +69,9 @@ private:
     const ProviderLog log_;
     AnalyticsConfiguration configuration_;
     EventLosses losses_;
-    std::atomic<std::uint64_t> kept_ = 0;
 
     std::unique_ptr<SqliteEventFile> database_; // null: could not be opened
+    ledger::StoreState state_; // of the database; bytes and oldest event as of the last check
     StoreError openError_ = StoreError::Other;
     double openAgainAt_ = 0; // here and below: uptime, in seconds
     std::uint64_t logBytesAtCheckpoint_ = 0;

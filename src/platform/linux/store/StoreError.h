@@ -1,9 +1,10 @@
-// Why the analytics store failed, in words that help its owner.
+// Why the analytics store failed.
 #pragma once
+
+#include "ledger/Counter.h"
 
 #include <cstddef>
 #include <cstdint>
-#include <string_view>
 
 namespace platform {
 
@@ -22,11 +23,7 @@ enum class StoreError : std::uint8_t {
 };
 constexpr std::size_t storeErrorCount = static_cast<std::size_t>(StoreError::Other) + 1;
 
-struct StoreErrorWords {
-    std::string_view problem;
-    std::string_view remedy;
-};
-
-[[nodiscard]] StoreErrorWords words(StoreError error) noexcept;
+// Where events that are lost for that reason are counted, with the words for the reason and what helps.
+[[nodiscard]] ledger::Counter counterOf(StoreError error) noexcept;
 
 } // namespace platform

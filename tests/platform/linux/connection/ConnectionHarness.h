@@ -56,7 +56,7 @@ protected:
     {
         auto socket = platform::ListeningSocket::bind(path);
         ASSERT_TRUE(socket) << description(socket.error());
-        auto created = platform::LinuxConnectionListener::create(*std::move(socket), connectionTestCategory);
+        auto created = platform::LinuxConnectionListener::create(*std::move(socket), ledger, connectionTestCategory);
         ASSERT_TRUE(created) << created.error().message();
         listener = *std::move(created);
         listener->setDelegate(*this);
@@ -101,10 +101,19 @@ protected:
     {
         return progress.look([&] { return record.calls.size(); });
     }
+    [[nodiscard]] std::uint64_t counted(ledger::Counter counter) const { return ledger.account()[counter]; }
+    [[nodiscard]] bool waitForCount(ledger::Counter counter, std::uint64_t value)
+    {
+        return waitUntil([&] { return counted(counter) >= value; });
+    }
     [[nodiscard]] bool waitForCounter(const std::atomic<std::uint64_t>& counter, std::uint64_t value)
     {
+        return waitUntil([&] { return counter >= value; });
+    }
+    template <typename Condition> [[nodiscard]] static bool waitUntil(Condition condition)
+    {
         const auto deadline = std::chrono::steady_clock::now() + longestWait;
-        while (counter < value) {
+        while (!condition()) {
             if (std::chrono::steady_clock::now() > deadline)
                 return false;
             std::this_thread::yield();
@@ -128,6 +137,7 @@ protected:
     std::vector<std::shared_ptr<ConnectionRecord>> records;
     Handler handler; // instead of keeping the call
     std::function<void()> beforeListening; // sets up the listener
+    ledger::Ledger ledger;
     std::unique_ptr<platform::LinuxConnectionListener> listener;
     std::thread thread;
 

@@ -11,6 +11,7 @@ namespace platform {
 namespace {
 
 using foundation::Array;
+using ledger::Counter;
 using support::answerTo;
 using support::callNumber;
 using support::ConnectionRecord;
@@ -30,7 +31,7 @@ protected:
             while (!unfinished.empty()) {
                 const std::size_t count = client.writeWhatFits(unfinished);
                 unfinished.erase(0, count);
-                if (count == 0 && listener->counters().readingPauses == 1)
+                if (count == 0 && counted(Counter::ReadingPauses) == 1)
                     return number;
             }
         }
@@ -62,7 +63,7 @@ TEST_F(ConnectionLimits, WhoDoesNotReadItsAnswersHoldsUpOnlyItself)
 
     for (int answer = 1; answer <= answers; ++answer)
         support::sendAtOnce(*record.connection, answerTo({answer}, answerSize));
-    EXPECT_EQ(listener->counters().readingPauses, 1U);
+    EXPECT_EQ(counted(Counter::ReadingPauses), 1U);
     client.write(callNumber(1));
 
     other.write(callNumber(1));
@@ -75,7 +76,7 @@ TEST_F(ConnectionLimits, WhoDoesNotReadItsAnswersHoldsUpOnlyItself)
         EXPECT_EQ(client.readNumber(), answer);
     EXPECT_TRUE(waitForHistory(record, {"call 1"}));
     EXPECT_THAT(logged(), IsEmpty());
-    EXPECT_EQ(listener->counters().droppedBytes, 0U);
+    EXPECT_EQ(counted(Counter::AnswerBytesDropped), 0U);
 }
 
 TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
@@ -94,8 +95,8 @@ TEST_F(ConnectionLimits, WhoLeavesFarTooManyAnswersUnreadIsCutOff)
     }
     EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
     EXPECT_THAT(logged(), ElementsAre(endsBecause("it does not read its answers")));
-    EXPECT_GT(listener->counters().droppedBytes, LinuxConnection::mostUnsentBytes);
-    EXPECT_LE(listener->counters().droppedBytes, sent);
+    EXPECT_GT(counted(Counter::AnswerBytesDropped), LinuxConnection::mostUnsentBytes);
+    EXPECT_LE(counted(Counter::AnswerBytesDropped), sent);
     EXPECT_THAT(loggedBehind(),
                 ElementsAre(testing::MatchesRegex("connection of process .* was behind: reading paused "
                                                   "1 times, [0-9]+ bytes of answers were dropped")));
@@ -112,7 +113,7 @@ TEST_F(ConnectionLimits, AnAnswerThatNoFrameHoldsBreaksTheConnection)
     support::sendAtOnce(*record.connection, std::string(longestFrame + 1, 'x'));
     EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
     EXPECT_THAT(logged(), ElementsAre(endsBecause("an answer is longer than a frame may be")));
-    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + longestFrame + 1);
+    EXPECT_EQ(counted(Counter::AnswerBytesDropped), frameHeadSize + longestFrame + 1);
 }
 
 TEST_F(ConnectionLimits, ReadingStopsWhileTheBytesOfUnansweredCallsAreTooMany)
@@ -138,7 +139,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheBytesOfUnansweredCallsAreTooMany)
     answered.clear();
     client.write(unfinished);
     EXPECT_TRUE(waitForCalls(record, 1));
-    EXPECT_EQ(listener->counters().interrupted, 0U);
+    EXPECT_EQ(counted(Counter::ConnectionsInterrupted), 0U);
 }
 
 TEST_F(ConnectionLimits, ReadingStopsWhileTheUnansweredCallsAreTooMany)
@@ -168,7 +169,7 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAllTheSame)
     support::sendAtOnce(*record.connection, answerTo({1}));
     client.write(callNumber(2));
     EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2"}));
-    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({1}).size());
+    EXPECT_EQ(counted(Counter::AnswerBytesDropped), frameHeadSize + answerTo({1}).size());
     client.close();
     EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2", "invalidated"}));
 }
@@ -200,7 +201,7 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDroppe
     client.stopReading();
     for (WorkItem& letter : letters)
         letter();
-    EXPECT_GT(listener->counters().droppedBytes, 2 * LinuxConnection::manyUnsentBytes);
+    EXPECT_GT(counted(Counter::AnswerBytesDropped), 2 * LinuxConnection::manyUnsentBytes);
     client.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(record, {"call 1"}));
 }
@@ -311,14 +312,14 @@ TEST_F(Descriptors, ClientsWaitUntilThereIsADescriptorForThem)
     ConnectionRecord& ofThird = connected();
     limitTo(nextDescriptor() + 1);
     SocketClient waiting(path); // takes the last descriptor, so that the service has none to accept it
-    ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
+    ASSERT_TRUE(waitForCount(Counter::AcceptingPauses, 1));
 
     // Meanwhile the others are served, and the service does not try again and again.
     third.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(ofThird, {"call 1"}));
     first.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(record, {"call 1"}));
-    EXPECT_EQ(listener->counters().acceptingPauses, 1U);
+    EXPECT_EQ(counted(Counter::AcceptingPauses), 1U);
     EXPECT_THAT(logged(), ElementsAre("new connections have to wait, with 3 open: Too many open files"));
 
     // The end of a connection makes room immediately.
@@ -333,7 +334,7 @@ TEST_F(Descriptors, ClientsAreAcceptedAfterAPauseWhenDescriptorsWereFreedElsewhe
     listen();
     limitTo(nextDescriptor() + 1);
     SocketClient waiting(path);
-    ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
+    ASSERT_TRUE(waitForCount(Counter::AcceptingPauses, 1));
     ::setrlimit(RLIMIT_NOFILE, &before);
     waiting.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
@@ -354,8 +355,8 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
     }
     for (int attempt = 0; attempt < 3; ++attempt)
         EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt) << "it is closed immediately";
-    EXPECT_EQ(listener->counters().refused, 3U);
-    EXPECT_EQ(listener->counters().accepted, mostOfOneUser);
+    EXPECT_EQ(counted(Counter::ConnectionsRefused), 3U);
+    EXPECT_EQ(counted(Counter::ConnectionsAccepted), mostOfOneUser);
     EXPECT_THAT(
         logged(),
         ElementsAre("user " + std::to_string(::getuid()) + " has 6 connections and gets no more until one ends"));
@@ -383,8 +384,8 @@ TEST_F(Descriptors, SomeAreKeptFromClients)
     }
     SocketClient waiting(path);
     waiting.write(callNumber(1));
-    ASSERT_TRUE(waitForCounter(listener->counters().acceptingPauses, 1));
-    EXPECT_EQ(listener->counters().accepted, most);
+    ASSERT_TRUE(waitForCount(Counter::AcceptingPauses, 1));
+    EXPECT_EQ(counted(Counter::ConnectionsAccepted), most);
     clients.pop_back();
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
     EXPECT_THAT(logged(), ElementsAre("new connections have to wait, with 3 open: Too many open files"));

@@ -19,6 +19,7 @@ namespace {
 
 using foundation::Array;
 using foundation::Value;
+using ledger::Counter;
 using support::answerTo;
 using support::callNumber;
 using support::ConnectionRecord;
@@ -106,9 +107,9 @@ TEST_F(Connections, DropAndCountWhatIsSentToThemWhenTheyAreOver)
     ConnectionRecord& record = connected();
     client.close();
     ASSERT_TRUE(waitForHistory(record, {"invalidated"}));
-    EXPECT_EQ(listener->counters().droppedBytes, 0U);
+    EXPECT_EQ(counted(Counter::AnswerBytesDropped), 0U);
     support::sendAtOnce(*record.connection, std::string(100, 'x'));
-    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + 100);
+    EXPECT_EQ(counted(Counter::AnswerBytesDropped), frameHeadSize + 100);
 }
 
 TEST_F(Connections, DiscardDescriptorsThatAClientPasses)
@@ -172,8 +173,8 @@ TEST_F(Connections, ServeAThousandClientsAtOnce)
         return std::ranges::all_of(
             records, [](const auto& record) { return record->history == std::vector<std::string>{"invalidated"}; });
     }));
-    EXPECT_EQ(listener->counters().accepted, count);
-    EXPECT_EQ(listener->counters().interrupted, 0U);
+    EXPECT_EQ(counted(Counter::ConnectionsAccepted), count);
+    EXPECT_EQ(counted(Counter::ConnectionsInterrupted), 0U);
     ::setrlimit(RLIMIT_NOFILE, &before);
 }
 
@@ -189,7 +190,7 @@ TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerClosesBetweenFrames)
     client.close();
     EXPECT_TRUE(waitForHistory(connected(), {"call 1", "invalidated"}));
     EXPECT_THAT(logged(), IsEmpty());
-    EXPECT_EQ(listener->counters().interrupted, 0U);
+    EXPECT_EQ(counted(Counter::ConnectionsInterrupted), 0U);
 }
 
 TEST_F(ConnectionEnds, WithoutInterruptionWhenThePeerOnlyStopsWriting)
@@ -210,7 +211,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionInsideAFrame)
     client.close();
     EXPECT_TRUE(waitForHistory(connected(), {"call 1", "interrupted", "invalidated"}));
     EXPECT_THAT(logged(), ElementsAre(endsBecause("the stream ends inside a frame")));
-    EXPECT_EQ(listener->counters().interrupted, 1U);
+    EXPECT_EQ(counted(Counter::ConnectionsInterrupted), 1U);
 }
 
 TEST_F(ConnectionEnds, WithAnInterruptionInsideAHead)
@@ -258,7 +259,7 @@ TEST_F(ConnectionEnds, WithAnInterruptionWhenAnAnswerFindsThePeerGone)
     isHeldUp.wait(); // the connection thread is busy, so only the answer can find that the peer has gone
     client.close();
     support::sendAtOnce(*record.connection, answerTo({2}));
-    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({2}).size());
+    EXPECT_EQ(counted(Counter::AnswerBytesDropped), frameHeadSize + answerTo({2}).size());
     proceed.count_down();
     EXPECT_TRUE(waitForHistory(record, {"interrupted", "invalidated"}));
     EXPECT_THAT(logged(), ElementsAre(endsBecause("Connection reset by peer")));
@@ -303,7 +304,7 @@ TEST_P(Violations, EndThatConnectionWithOneLineAndNoOther)
     EXPECT_TRUE(waitForHistory(badRecord, {"call 1", "interrupted", "invalidated"}));
     EXPECT_EQ(bad.readNumber(), std::nullopt);
     EXPECT_THAT(logged(), ElementsAre(endsBecause(GetParam().reason)));
-    EXPECT_EQ(listener->counters().interrupted, 1U);
+    EXPECT_EQ(counted(Counter::ConnectionsInterrupted), 1U);
 
     good.write(callNumber(2));
     EXPECT_TRUE(waitForHistory(goodRecord, {"call 1", "call 2"}));
@@ -435,7 +436,7 @@ TEST_F(Turns, SendNothingToConnectionsThatEndedMeanwhile)
     client.close();
     ASSERT_TRUE(waitForHistory(record, {"invalidated"}));
     ended[0]();
-    EXPECT_EQ(listener->counters().droppedBytes, frameHeadSize + answerTo({1}).size());
+    EXPECT_EQ(counted(Counter::AnswerBytesDropped), frameHeadSize + answerTo({1}).size());
 }
 
 TEST_F(Turns, AreHelpedWithByTheConnectionThread)

@@ -19,6 +19,7 @@
 #include <future>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <limits>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -28,6 +29,7 @@ namespace platform {
 namespace {
 
 using foundation::Dictionary;
+using ledger::Counter;
 using support::StoreReader;
 using testing::ElementsAre;
 using testing::Field;
@@ -45,7 +47,7 @@ protected:
     {
         if (!store_)
             store_ = std::make_unique<AnalyticsStore>(
-                std::make_unique<SqliteKeeper>(temporary.path(), clock, ProviderLog(log)), watcher, clock,
+                std::make_unique<SqliteKeeper>(temporary.path(), clock, ProviderLog(log)), watcher, clock, ledger,
                 ProviderLog(log), limits);
         return *store_;
     }
@@ -80,6 +82,7 @@ protected:
                                            [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
         store().flush();
     }
+    [[nodiscard]] std::uint64_t kept() const { return ledger.account()[ledger::Counter::Kept]; }
     [[nodiscard]] std::int64_t storedEvents() { return StoreReader(file).eventCount(); }
 
     // Keeps the store's thread busy as long as this object exists; the thread writes nothing meanwhile.
@@ -114,11 +117,12 @@ protected:
     const fs::path file = temporary.path() / "analytics.sqlite3";
     support::ManualClock clock;
     support::FakeLog log;
+    ledger::Ledger ledger;
     ConfigurationWatcher watcher{temporary.path(), ProviderLog(log)};
     AnalyticsStore::Limits limits;
 
 private:
-    std::unique_ptr<AnalyticsStore> store_;
+    std::unique_ptr<AnalyticsStore> store_; // uses all others
 };
 
 TEST_F(AnalyticsStoreTest, StampsAnEventWithTheTimeAtWhichItWasSent)
@@ -167,7 +171,7 @@ TEST_F(AnalyticsStoreTest, AnEventOutsideATurnIsKeptWithoutAnybodyAsking)
 {
     send(1);
     const auto deadline = std::chrono::steady_clock::now() + 20s;
-    while (store().keptEvents() == 0 && std::chrono::steady_clock::now() < deadline)
+    while (kept() == 0 && std::chrono::steady_clock::now() < deadline)
         std::this_thread::yield();
     EXPECT_EQ(storedEvents(), 1);
 }
@@ -193,7 +197,7 @@ TEST_F(AnalyticsStoreTest, WhatATurnSentIsNotWrittenBeforeItsEnd)
             // Meanwhile another thread sends something.
             std::thread([&] {
                 send(3, "com.quarn.other");
-                while (store().keptEvents() == 0)
+                while (kept() == 0)
                     std::this_thread::yield();
             }).join();
             EXPECT_EQ(StoreReader(file).texts("SELECT name FROM events"), std::vector<std::string>{"com.quarn.other"});
@@ -263,8 +267,8 @@ TEST_F(AnalyticsStoreTest, ManyTurnsAndManyOtherThreadsLoseNothingAndKeepTheirOr
     {
         LinuxWorkQueues queues;
         queues.setTurnEndHandler([&](Turn& turn) {
-            store().endTurn(turn, [&, expected = store().keptEvents()] {
-                EXPECT_GE(store().keptEvents(), expected);
+            store().endTurn(turn, [&, expected = kept()] {
+                EXPECT_GE(kept(), expected);
                 ++acknowledged;
             });
         });
@@ -300,10 +304,10 @@ TEST_F(AnalyticsStoreTest, FlushMayBeCalledFromAnyThread)
     for (int thread = 0; thread < 4; ++thread)
         threads.emplace_back([this] {
             for (int number = 0; number < 20; ++number) {
-                const std::uint64_t before = store().keptEvents();
+                const std::uint64_t before = kept();
                 send(number);
                 store().flush();
-                EXPECT_GT(store().keptEvents(), before);
+                EXPECT_GT(kept(), before);
             }
         });
 }
@@ -407,9 +411,10 @@ TEST_F(AnalyticsStoreTest, KillingTheServiceLosesNothingThatWasAcknowledged)
         fs::create_directory(directory);
         const pid_t service = ::fork();
         if (service == 0) {
+            ledger::Ledger childsLedger;
             ConfigurationWatcher childsWatcher(directory, ProviderLog(log));
             AnalyticsStore childsStore(std::make_unique<SqliteKeeper>(directory, clock, ProviderLog(log)),
-                                       childsWatcher, clock, ProviderLog(log));
+                                       childsWatcher, clock, childsLedger, ProviderLog(log));
             Turn turn;
             for (std::int64_t number = 1;; ++number) {
                 childsStore.sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });
@@ -500,6 +505,99 @@ TEST_F(AnalyticsStoreTest, NewBoundsAreAppliedWithoutAnotherEvent)
     EXPECT_TRUE(becomesTrue([&] { return storedEvents() == 0; }));
 }
 
+// --- The ledger
+
+TEST_F(AnalyticsStoreTest, CountsWhatBecameOfEachEvent)
+{
+    support::writeFile(temporary.path() / "analytics.toml", "used = [\"com.quarn.kesto.*\"]\n");
+    Turn turn;
+    sendIn(turn, 1);
+    sendIn(turn, 2);
+    store().sendAnalyticsEventLazy(turn, "com.quarn.other", [] { return Dictionary(); });
+    store().sendAnalyticsEventLazy(turn, eventName,
+                                   [] { return Dictionary{{"n", std::numeric_limits<double>::infinity()}}; });
+    turn.tally.add(Counter::Deliveries, 4);
+    turn.tally.add(Counter::Recorded, 4);
+    EXPECT_EQ(ledger.account()[Counter::Events], 0U) << "the turn has not ended";
+    store().endTurn(turn, nullptr);
+    EXPECT_TRUE(turn.tally.empty());
+    send(3);
+    send(4, "com.quarn.other");
+    store().flush();
+    const auto account = ledger.account();
+    EXPECT_EQ(account[Counter::Events], 6U);
+    EXPECT_EQ(account[Counter::Kept], 3U);
+    EXPECT_EQ(account[Counter::Unwanted], 2U);
+    EXPECT_EQ(account[Counter::LostNotJson], 1U);
+    EXPECT_EQ(account[Counter::Deliveries], 4U);
+    EXPECT_EQ(account[Counter::Recorded], 4U);
+    EXPECT_EQ(account.store.events, 3U);
+}
+
+TEST_F(AnalyticsStoreTest, CountsATurnWithoutEventsToo)
+{
+    store().flush();
+    Turn turn;
+    turn.tally.add(Counter::Deliveries);
+    turn.tally.add(Counter::Inert);
+    store().endTurn(turn, nullptr);
+    EXPECT_EQ(ledger.account()[Counter::Deliveries], 1U);
+    EXPECT_EQ(ledger.account()[Counter::Inert], 1U);
+}
+
+TEST_F(AnalyticsStoreTest, WhatIsAcknowledgedIsCounted)
+{
+    for (std::uint64_t turn = 1; turn <= 50; ++turn) {
+        std::promise<std::uint64_t> counted;
+        runTurn([&](Turn& running) { sendIn(running, 1); }, [&] { counted.set_value(kept()); });
+        ASSERT_EQ(counted.get_future().get(), turn);
+    }
+}
+
+TEST_F(AnalyticsStoreTest, ALargeTurnThatIsWrittenInPartsIsCountedInWholeParts)
+{
+    limits.mostEvents = 10;
+    Turn turn;
+    for (int number = 1; number <= 25; ++number)
+        sendIn(turn, number);
+    const auto account = ledger.account();
+    EXPECT_EQ(account[Counter::Events], account[Counter::Kept]);
+    store().endTurn(turn, nullptr);
+    store().flush();
+    EXPECT_EQ(ledger.account()[Counter::Events], 25U);
+    EXPECT_EQ(ledger.account()[Counter::Kept], 25U);
+}
+
+// As after a kill between the commit and the posting, or when the ledger's file is gone.
+TEST_F(AnalyticsStoreTest, EventsInTheDatabaseThatTheLedgerDoesNotKnowAreCountedAsKept)
+{
+    send(1);
+    send(2);
+    closeStore();
+    ledger::Ledger fresh;
+    AnalyticsStore second(std::make_unique<SqliteKeeper>(temporary.path(), clock, ProviderLog(log)), watcher, clock,
+                          fresh, ProviderLog(log));
+    second.sendAnalyticsEventLazy(outsideTurn, eventName, [] { return Dictionary(); });
+    second.flush();
+    EXPECT_EQ(fresh.account()[Counter::Events], 3U);
+    EXPECT_EQ(fresh.account()[Counter::Kept], 3U);
+    EXPECT_EQ(fresh.account().stored(), 3U);
+}
+
+TEST_F(AnalyticsStoreTest, EventsThatVanishWithTheirDatabaseAreCountedAsRemovedByDamage)
+{
+    send(1);
+    send(2);
+    store().flush();
+    fs::remove(file);
+    send(3);
+    store().flush();
+    EXPECT_EQ(ledger.account()[Counter::Kept], 3U);
+    EXPECT_EQ(ledger.account()[Counter::RemovedByDamage], 2U);
+    EXPECT_EQ(ledger.account().stored(), 1U);
+    EXPECT_EQ(storedEvents(), 1);
+}
+
 // Tidies in many small steps, and says when the last of them is done.
 class SlowlyTidiedKeeper final : public support::MemoryKeeper {
 public:
@@ -509,7 +607,7 @@ public:
     {
     }
 
-    bool tidy(bool) override
+    bool tidy(bool, ledger::Tally&) override
     {
         if (--stepsLeft_ == 0)
             done_.set_value();
@@ -524,7 +622,8 @@ private:
 TEST_F(AnalyticsStoreTest, TidiesToTheEndWhileItHasNothingElseToDo)
 {
     std::promise<void> done;
-    const AnalyticsStore idle(std::make_unique<SlowlyTidiedKeeper>(clock, done), watcher, clock, ProviderLog(log));
+    const AnalyticsStore idle(std::make_unique<SlowlyTidiedKeeper>(clock, done), watcher, clock, ledger,
+                              ProviderLog(log));
     EXPECT_EQ(done.get_future().wait_for(20s), std::future_status::ready);
 }
 

@@ -5,7 +5,6 @@
 #include "platform/Clock.h"
 #include "platform/linux/store/EventKeeper.h"
 
-#include <atomic>
 #include <memory>
 #include <string>
 #include <vector>
@@ -50,45 +49,49 @@ public:
         configuration_ = configuration;
     }
     void open() override { }
-    void keep(platform::EventBatch& events) override
+    void keep(platform::EventBatch& events, ledger::Tally& tally) override
     {
         const auto rows = events.rows();
         place_->change([&](std::vector<KeptEvent>& kept) {
             for (const auto& [time, name, payload] : rows)
                 kept.push_back({time, std::string(name), std::string(payload)});
         });
-        kept_ += rows.size();
-        notJson_ += events.size() - rows.size();
+        tally.add(ledger::Counter::Kept, rows.size());
+        tally.add(ledger::Counter::LostNotJson, events.size() - rows.size());
     }
     [[nodiscard]] bool awaitsQuiet() const override { return false; }
-    bool tidy(bool) override
+    bool tidy(bool, ledger::Tally& tally) override
     {
         constexpr double secondsADay = 86400;
         const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
         place_->change([&](std::vector<KeptEvent>& kept) {
-            std::erase_if(kept, [&](const KeptEvent& event) { return event.time < tooOld; });
+            tally.add(ledger::Counter::RemovedForAge,
+                      std::erase_if(kept, [&](const KeptEvent& event) { return event.time < tooOld; }));
             std::size_t bytes = 0;
             for (const KeptEvent& event : kept)
                 bytes += event.name.size() + event.payload.size();
             while (bytes > configuration_.maximumSizeMegabytes * 1024 * 1024) {
                 bytes -= kept.front().name.size() + kept.front().payload.size();
                 kept.erase(kept.begin());
+                tally.add(ledger::Counter::RemovedForSize);
             }
         });
         return false;
     }
-    [[nodiscard]] std::uint64_t keptEvents() const noexcept override { return kept_; }
-    [[nodiscard]] std::uint64_t lostEvents(platform::StoreError reason) const noexcept override
+    [[nodiscard]] std::optional<ledger::StoreState> state() const override
     {
-        return reason == platform::StoreError::NotJson ? notJson_.load() : 0;
+        const auto events = place_->all();
+        ledger::StoreState state{
+            .events = events.size(), .bytes = 0, .oldest = events.empty() ? 0 : events.front().time};
+        for (const KeptEvent& event : events)
+            state.bytes += event.name.size() + event.payload.size();
+        return state;
     }
 
 private:
     const std::shared_ptr<KeptEvents> place_;
     const platform::Clock& clock_;
     platform::AnalyticsConfiguration configuration_;
-    std::atomic<std::uint64_t> kept_ = 0;
-    std::atomic<std::uint64_t> notJson_ = 0;
 };
 
 } // namespace support

@@ -83,17 +83,17 @@ protected:
         return *keeper_;
     }
     void closeWriter() { keeper_.reset(); }
-    static void keepIn(SqliteKeeper& keeper, const std::vector<PlainEvent>& given)
+    static void keepIn(SqliteKeeper& keeper, const std::vector<PlainEvent>& given, ledger::Tally& tally)
     {
         EventBatch batch;
         for (const auto& [time, name, payload] : given)
             batch.add(time, name, payload);
-        keeper.keep(batch);
+        keeper.keep(batch, tally);
     }
-    void keep(const std::vector<PlainEvent>& given) { keepIn(keeper(), given); }
+    void keep(const std::vector<PlainEvent>& given) { keepIn(keeper(), given, tally); }
     void maintain(bool isQuiet = true)
     {
-        while (keeper().tidy(isQuiet)) { }
+        while (keeper().tidy(isQuiet, tally)) { }
     }
     std::uint64_t logBytes() const { return fs::file_size(directory / "analytics.sqlite3-wal"); }
     [[nodiscard]] std::vector<std::string> filesNamed(std::string_view part) const
@@ -105,7 +105,7 @@ protected:
         std::ranges::sort(names);
         return names;
     }
-    std::uint64_t lost(StoreError reason) { return keeper().lostEvents(reason); }
+    std::uint64_t lost(StoreError reason) { return tally[counterOf(reason)]; }
 
     support::TemporaryDirectory temporary;
     fs::path directory = temporary.path();
@@ -113,6 +113,7 @@ protected:
     support::ManualClock clock;
     support::FakeLog log;
     AnalyticsConfiguration configuration;
+    ledger::Tally tally; // of all keepers
 
 private:
     std::unique_ptr<SqliteKeeper> keeper_;
@@ -141,7 +142,7 @@ TEST_F(SqliteKeeperTest, KeepsEventsInTheirOrder)
     EXPECT_THAT(reader.texts("SELECT id || ' ' || time || ' ' || name || ' ' || payload FROM events ORDER BY id"),
                 ElementsAre("1 1800000000.25 a {\"n\":1,\"text\":\"x\\\"y\\n\"}", "2 1700000000.0 b {}",
                             "3 1800000001.0 c {\"yes\":true,\"share\":0.6}"));
-    EXPECT_EQ(keeper().keptEvents(), 3U);
+    EXPECT_EQ(tally[ledger::Counter::Kept], 3U);
 }
 
 TEST_F(SqliteKeeperTest, NumbersOfRowsOnEverySideOfTheStatementsSize)
@@ -206,7 +207,7 @@ TEST_F(SqliteKeeperTest, WhatJsonCannotSayIsLostAndNothingElse)
     EXPECT_THAT(StoreReader(file()).texts("SELECT name || payload FROM events ORDER BY id"),
                 ElementsAre("a{\"key\":1}", "e{\"key\":1}"));
     EXPECT_EQ(lost(StoreError::NotJson), 3U);
-    EXPECT_EQ(keeper().keptEvents(), 2U);
+    EXPECT_EQ(tally[ledger::Counter::Kept], 2U);
     EXPECT_THAT(log.take(),
                 ElementsAre(support::IsLine(LogLevel::Error, "kerl",
                                             "3 analytics events were lost (3 since the start): " + file().string()
@@ -296,7 +297,7 @@ TEST_F(SqliteKeeperTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
     }
     keep({event(1, "after")});
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events"), ElementsAre("after"));
-    EXPECT_EQ(keeper().keptEvents(), 1U);
+    EXPECT_EQ(tally[ledger::Counter::Kept], 5001U);
     EXPECT_THAT(filesNamed(".corrupt-"), SizeIs(3)); // with the log and its index
     EXPECT_THAT(log.take(), ElementsAre(Field(&LogLine::message, HasSubstr("is damaged or not a database of events"))));
 }
@@ -385,11 +386,12 @@ TEST_F(SqliteKeeperTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
                                         HasSubstr("another process keeps its events in the same directory; "
                                                   "give each service its own state directory")))));
     const std::vector<PlainEvent> given{event(2, "second")};
-    keepIn(second, given);
-    EXPECT_EQ(second.lostEvents(StoreError::InUse), 1U);
+    ledger::Tally lost;
+    keepIn(second, given, lost);
+    EXPECT_EQ(lost[ledger::Counter::LostToOtherService], 1U);
     closeWriter();
     clock.advance(SqliteKeeper::secondsBetweenOpenings);
-    keepIn(second, given);
+    keepIn(second, given, lost);
     EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM events ORDER BY id"), ElementsAre("first", "second"));
 }
 
@@ -486,8 +488,8 @@ TEST_F(SqliteKeeperTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
     const std::uint64_t lostEvents = lost(StoreError::DiskFull);
     EXPECT_GT(lostEvents, 0U);
     EXPECT_EQ(lostEvents % 100, 0U); // only whole transactions
-    EXPECT_EQ(keeper().keptEvents() + lostEvents, given);
-    EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(keeper().keptEvents()));
+    EXPECT_EQ(tally[ledger::Counter::Kept] + lostEvents, given);
+    EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(tally[ledger::Counter::Kept]));
     EXPECT_THAT(log.take(),
                 ElementsAre(Field(&LogLine::message,
                                   AllOf(StartsWith("100 analytics events were lost (100 since the start): "),
@@ -516,11 +518,11 @@ TEST_F(SqliteKeeperTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
         for (int round = 0; round < 10; ++round)
             keep(events(200));
         EXPECT_GT(lost(StoreError::DiskFull), 0U);
-        EXPECT_EQ(keeper().keptEvents() + lost(StoreError::DiskFull), 2010U);
+        EXPECT_EQ(tally[ledger::Counter::Kept] + lost(StoreError::DiskFull), 2010U);
         ::setrlimit(RLIMIT_FSIZE, &limit);
-        const std::uint64_t before = keeper().keptEvents();
+        const std::uint64_t before = tally[ledger::Counter::Kept];
         keep(events(200));
-        EXPECT_EQ(keeper().keptEvents(), before + 200);
+        EXPECT_EQ(tally[ledger::Counter::Kept], before + 200);
         EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(before + 200));
         ::_exit(HasFailure() ? 1 : 0);
     }
@@ -550,7 +552,7 @@ TEST_F(SqliteKeeperTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)
 
 TEST_F(SqliteKeeperTest, WithoutADatabaseNothingIsLeftToTidy)
 {
-    EXPECT_FALSE(keeper().tidy(true));
+    EXPECT_FALSE(keeper().tidy(true, tally));
     EXPECT_FALSE(keeper().awaitsQuiet());
 }
 
@@ -815,7 +817,7 @@ TEST_F(SqliteKeeperTest, HousekeepingIsDoneInSmallSteps)
     configuration.maximumSizeMegabytes = 1;
     keeper().setConfiguration(configuration);
     int steps = 1;
-    while (keeper().tidy(true))
+    while (keeper().tidy(true, tally))
         ++steps;
     EXPECT_GT(steps, 15);
 }

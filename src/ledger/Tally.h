@@ -1,0 +1,54 @@
+// Counts that belong together and reach the ledger together: what one turn of the server queue did, or one batch of the
+// store. So the ledger's sums hold at every moment, and also in what a killed service leaves behind.
+#pragma once
+
+#include "ledger/Counter.h"
+#include "ledger/Culprit.h"
+
+#include <array>
+#include <cstdint>
+#include <span>
+#include <vector>
+
+namespace ledger {
+
+// One thread at a time.
+class Tally {
+public:
+    using Counts = std::array<std::uint64_t, counterCount>;
+    struct Charged {
+        Charge charge;
+        Culprit culprit;
+        std::uint64_t count;
+    };
+    // What goes beyond is charged to nobody known.
+    static constexpr std::size_t mostCharged = 256;
+
+    void add(Counter counter, std::uint64_t count = 1) noexcept
+    {
+        counts_[static_cast<std::size_t>(counter)] += count;
+        isEmpty_ = false;
+    }
+    // Adds to a counter that has a charge, and to what the culprit is charged with.
+    void add(Counter counter, const Culprit& culprit, std::uint64_t count = 1);
+    // Adds what the other counted; it is then empty.
+    void takeFrom(Tally& other);
+    void clear();
+
+    [[nodiscard]] bool empty() const noexcept { return isEmpty_; }
+    [[nodiscard]] std::uint64_t operator[](Counter counter) const noexcept
+    {
+        return counts_[static_cast<std::size_t>(counter)];
+    }
+    [[nodiscard]] const Counts& counts() const noexcept { return counts_; }
+    [[nodiscard]] std::span<const Charged> charged() const noexcept { return charged_; }
+
+private:
+    void charge(Charge charge, const Culprit& culprit, std::uint64_t count);
+
+    Counts counts_ = {};
+    std::vector<Charged> charged_;
+    bool isEmpty_ = true;
+};
+
+} // namespace ledger

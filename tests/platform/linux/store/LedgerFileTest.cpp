@@ -1,0 +1,144 @@
+// The ledger in its file: it goes on after the process, however that ended.
+#include "platform/linux/store/LedgerFile.h"
+
+#include "ledger/Ledger.h"
+#include "platform/linux/store/ManualClock.h"
+#include "support/TemporaryDirectory.h"
+#include "support/fakes/FakeLog.h"
+
+#include <csignal>
+#include <fstream>
+#include <gmock/gmock.h>
+#include <sys/wait.h>
+
+namespace platform {
+namespace {
+
+using ledger::Counter;
+using ledger::Ledger;
+using testing::ElementsAre;
+using testing::HasSubstr;
+using testing::IsEmpty;
+
+namespace fs = std::filesystem;
+
+class LedgerFileTest : public testing::Test {
+protected:
+    [[nodiscard]] LedgerFile open() { return {temporary.path(), clock, ProviderLog(log)}; }
+    [[nodiscard]] std::vector<std::string> messages()
+    {
+        std::vector<std::string> messages;
+        for (const auto& line : log.take())
+            messages.push_back(line.message);
+        return messages;
+    }
+
+    support::TemporaryDirectory temporary;
+    const fs::path path = temporary.path() / "analytics.ledger";
+    support::ManualClock clock;
+    support::FakeLog log;
+};
+
+TEST_F(LedgerFileTest, BeginsAnEmptyLedger)
+{
+    LedgerFile file = open();
+    const Ledger ledger(file.image());
+    EXPECT_EQ(ledger.account().began, clock.secondsSince1970());
+    EXPECT_THAT(ledger.account().counts, testing::Each(0));
+    EXPECT_EQ(fs::file_size(path), sizeof(ledger::LedgerImage));
+    EXPECT_THAT(messages(), IsEmpty());
+}
+
+TEST_F(LedgerFileTest, GoesOnWhereItEnded)
+{
+    {
+        LedgerFile file = open();
+        Ledger(file.image()).count(Counter::Recorded, 5);
+    }
+    LedgerFile file = open();
+    EXPECT_EQ(Ledger(file.image()).account()[Counter::Recorded], 5U);
+}
+
+TEST_F(LedgerFileTest, AKilledProcessLeavesAllThatItPosted)
+{
+    int channel[2] = {};
+    ASSERT_EQ(::pipe(channel), 0);
+    const pid_t process = ::fork();
+    if (process == 0) {
+        LedgerFile file = open();
+        Ledger ledger(file.image());
+        for (std::uint64_t number = 1;; ++number) {
+            ledger::Tally tally;
+            tally.add(Counter::Events, 3);
+            tally.add(Counter::Kept, 2);
+            tally.add(Counter::Unwanted, 1);
+            ledger.post(tally);
+            if (::write(channel[1], &number, sizeof number) != sizeof number)
+                std::_Exit(1);
+        }
+    }
+    ::close(channel[1]);
+    std::uint64_t posted = 0;
+    while (posted < 1000)
+        ASSERT_EQ(::read(channel[0], &posted, sizeof posted), static_cast<ssize_t>(sizeof posted));
+    ::kill(process, SIGKILL);
+    ::waitpid(process, nullptr, 0);
+    while (::read(channel[0], &posted, sizeof posted) > 0) { }
+    ::close(channel[0]);
+
+    LedgerFile file = open();
+    const ledger::Account account = Ledger(file.image()).account();
+    EXPECT_GE(account[Counter::Events], 3 * posted);
+    EXPECT_LE(account[Counter::Events], 3 * (posted + 1));
+    EXPECT_EQ(account[Counter::Events], account[Counter::Kept] + account[Counter::Unwanted]);
+}
+
+TEST_F(LedgerFileTest, AFileOfAnotherVersionIsReplacedWithItsCounts)
+{
+    {
+        LedgerFile file = open();
+        Ledger(file.image()).count(Counter::Recorded, 5);
+        file.image().paths[0] = 'D';
+    }
+    LedgerFile file = open();
+    EXPECT_TRUE(file.image().canGoOn());
+    EXPECT_EQ(Ledger(file.image()).account()[Counter::Recorded], 5U);
+    LedgerFile other = open();
+    EXPECT_THAT(messages(), ElementsAre(HasSubstr("Resource temporarily unavailable")))
+        << "the new file is locked, too";
+}
+
+TEST_F(LedgerFileTest, AFileThatIsNotALedgerIsReplaced)
+{
+    for (const std::size_t size : {std::size_t{0}, std::size_t{100}, sizeof(ledger::LedgerImage)}) {
+        std::ofstream(path, std::ios::trunc) << std::string(size, 'x');
+        LedgerFile file = open();
+        EXPECT_THAT(Ledger(file.image()).account().counts, testing::Each(0)) << size;
+    }
+    EXPECT_THAT(messages(), IsEmpty());
+}
+
+TEST_F(LedgerFileTest, ASecondServiceCountsOnlyForItself)
+{
+    LedgerFile first = open();
+    LedgerFile second = open();
+    Ledger(second.image()).count(Counter::Recorded);
+    EXPECT_EQ(Ledger(first.image()).account()[Counter::Recorded], 0U);
+    EXPECT_EQ(Ledger(second.image()).account()[Counter::Recorded], 1U);
+    EXPECT_THAT(messages(),
+                ElementsAre("the ledger cannot be kept in " + path.native()
+                            + ": Resource temporarily unavailable; what the service counts ends with it: "
+                              "let its user write there"));
+}
+
+TEST_F(LedgerFileTest, WithoutADirectoryItCountsInMemory)
+{
+    LedgerFile file(temporary.path() / "missing", clock, ProviderLog(log));
+    Ledger ledger(file.image());
+    ledger.count(Counter::Recorded);
+    EXPECT_EQ(ledger.account()[Counter::Recorded], 1U);
+    EXPECT_THAT(messages(), ElementsAre(HasSubstr("No such file or directory")));
+}
+
+} // namespace
+} // namespace platform
