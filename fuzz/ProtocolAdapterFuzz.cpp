@@ -141,7 +141,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
 
     const auto protocol = std::make_shared<AnsweringProtocol>();
     const auto connection = std::make_shared<KeepingConnection>();
-    client::ServiceProtocolAdapter adapter(protocol);
+    static ledger::Ledger ledger;
+    client::ServiceProtocolAdapter adapter(protocol, ledger);
     const auto result = adapter.handleCall({*call, connection});
 
     const client::ServiceOperation* operation = operationOf(call->values());

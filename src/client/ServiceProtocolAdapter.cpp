@@ -5,7 +5,6 @@
 #include "client/ServiceOperations.h"
 #include "foundation/cbor/Cbor.h"
 #include "foundation/text/Format.h"
-#include "platform/Platform.h"
 
 #include <array>
 #include <limits>
@@ -256,7 +255,7 @@ std::expected<void, Connection::Violation> ServiceProtocolAdapter::handleCall(Co
         return violation(foundation::format("{} takes {} arguments, not {}", operation->name(),
                                             operation->arguments().size(), given.size()));
 
-    platform::current().ledger.count(counterOfCalls(*methodNumber));
+    ledger_.get().count(counterOfCalls(*methodNumber));
     Arguments arguments(operation->arguments(), given, ReplyAddress(std::move(call.caller), *callNumber));
     calls[static_cast<std::size_t>(*methodNumber) - 1](arguments, *exportedObject_);
     if (arguments.refusal())

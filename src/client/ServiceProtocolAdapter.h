@@ -6,9 +6,11 @@
 #pragma once
 
 #include "client/KestoReportingServiceProtocol.h"
+#include "ledger/Ledger.h"
 #include "platform/Connection.h"
 
 #include <expected>
+#include <functional>
 #include <memory>
 
 namespace client {
@@ -16,9 +18,10 @@ namespace client {
 // Each connection owns one and uses it on its thread.
 class ServiceProtocolAdapter {
 public:
-    // Calls go to the exported object.
-    explicit ServiceProtocolAdapter(std::shared_ptr<KestoReportingServiceProtocol> exportedObject)
-        : exportedObject_(std::move(exportedObject))
+    // Calls go to the exported object, and the ledger counts them.
+    ServiceProtocolAdapter(std::shared_ptr<KestoReportingServiceProtocol> exportedObject, ledger::Ledger& ledger)
+        : exportedObject_(std::move(exportedObject)),
+          ledger_(ledger)
     {
     }
 
@@ -27,6 +30,7 @@ public:
 
 private:
     std::shared_ptr<KestoReportingServiceProtocol> exportedObject_;
+    std::reference_wrapper<ledger::Ledger> ledger_;
 };
 
 } // namespace client

@@ -22,9 +22,8 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
         const auto client = std::make_shared<Client>(processIdentifier, weak_from_this(), connection->userIdentifier());
         weakClient = client;
         connection->setCallHandler(
-            [adapter = client::ServiceProtocolAdapter(client)](platform::Connection::Call call) mutable {
-                return adapter.handleCall(std::move(call));
-            });
+            [adapter = client::ServiceProtocolAdapter(client, platform::current().ledger)](
+                platform::Connection::Call call) mutable { return adapter.handleCall(std::move(call)); });
     }
     utility::serverQueue()->submit([self = shared_from_this(), weakClient] {
         if (const auto client = weakClient.lock())

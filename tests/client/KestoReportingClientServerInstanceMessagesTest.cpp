@@ -155,6 +155,14 @@ TEST_F(MessagesTest, AreDeliveredToNoMoreOfManySessionsThanTheirSizeAllows)
     EXPECT_EQ(send(player, Array(reporterIDs), large), answeredOnce(delivered)) << "the client is answered as always";
     EXPECT_THAT(platform.log.lines("kerc"), testing::Contains(told(1001)).Times(1));
     EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * receivers)) << "unknown sessions do not count";
+    const ledger::Account account = platform.ledger.account();
+    const auto refusals = static_cast<std::uint64_t>(sessions - receivers);
+    EXPECT_EQ(account[ledger::Counter::Deliveries], static_cast<std::uint64_t>(sessions));
+    EXPECT_EQ(account[ledger::Counter::Inert], static_cast<std::uint64_t>(receivers));
+    EXPECT_EQ(account[ledger::Counter::RefusedForSize], refusals);
+    ASSERT_THAT(account.culprits[0], SizeIs(1));
+    EXPECT_EQ(account.culprits[0][0].culprit, (ledger::Culprit{.user = 0, .process = "player", .application = ""}));
+    EXPECT_EQ(account.culprits[0][0].count, refusals);
     EXPECT_EQ(send(player, Array(reporterIDs)), answeredOnce(delivered));
     EXPECT_THAT(platform.analytics.sent(), SizeIs(2 * sessions)) << "a small message reaches all";
 
@@ -193,6 +201,36 @@ TEST_F(MessagesTest, ToAnEmptyListReachNobody)
     EXPECT_EQ(recorded(player, 42), std::nullopt);
     EXPECT_THAT(platform.analytics.asked(), IsEmpty());
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerc", "sending message for reporter []")));
+}
+
+TEST_F(MessagesTest, AreCountedByWhatBecameOfThem)
+{
+    using ledger::Counter;
+    platform.analytics.use("com.quarn.kesto.*");
+    makeSession(player, 42);
+    makeSession(recorder, 43, false);
+    const ledger::Account before = platform.ledger.account();
+    const auto since = [&](Counter counter) { return platform.ledger.account()[counter] - before[counter]; };
+    send(player, Array{42, 43, 44, 0});
+    send(player, Array{42});
+    send(player, Array{});
+    EXPECT_EQ(since(Counter::CallsSendMessage), 3U);
+    EXPECT_EQ(since(Counter::Deliveries), 3U) << "an unknown session gets no delivery";
+    EXPECT_EQ(since(Counter::Recorded), 1U);
+    EXPECT_EQ(since(Counter::Repeated), 1U);
+    EXPECT_EQ(since(Counter::Inert), 1U);
+    EXPECT_EQ(since(Counter::Events), 6U);
+    player.call(StopReportingSessionForID, 42);
+    const ledger::Account stopped = platform.ledger.account();
+    send(player, null); // to none, and so without a session
+    EXPECT_EQ(platform.ledger.account()[Counter::Inert] - stopped[Counter::Inert], 1U);
+    EXPECT_EQ(platform.ledger.account()[Counter::Events] - stopped[Counter::Events], 2U);
+    const ledger::Account account = platform.ledger.account();
+    EXPECT_EQ(account[Counter::Deliveries],
+              account[Counter::Recorded] + account[Counter::Repeated] + account[Counter::Inert]
+                  + account.sum(ledger::Charge::Refused));
+    EXPECT_EQ(account[Counter::Events],
+              account[Counter::Kept] + account[Counter::Unwanted] + account.sum(ledger::Charge::Lost));
 }
 
 // --- to all sessions

@@ -224,8 +224,14 @@ TEST_F(ClientServerInstanceTest, CreatesNoMoreSessionsThanItMayHave)
     create(most + 1);
     EXPECT_NE(player.session(most + 1), nullptr);
 
+    const ledger::Account account = platform.ledger.account();
+    EXPECT_EQ(account[ledger::Counter::SessionsRefused], 2U);
+    EXPECT_EQ(account[ledger::Counter::SessionsCreated], 10'003U);
+    EXPECT_EQ(account[ledger::Counter::SessionsGone], 2U) << "one replaced, one destroyed";
+
     harness.forget();
     player.close();
+    EXPECT_EQ(platform.ledger.account()[ledger::Counter::SessionsGone], 10'002U);
     EXPECT_THAT(platform.log.lines("kerc"),
                 testing::Contains(IsLine(
                     Error, "kerc", "client 1001 was refused 2 sessions: it may have 10000, and all clients 110000")));

@@ -1,6 +1,7 @@
 // The wire, call by call: which operation a frame means, which frames are refused and with which words, and the form of
 // answers.
 #include "client/ServiceProtocolAdapter.h"
+
 #include "client/ServiceOperations.h"
 #include "support/fakes/FakeConnection.h"
 
@@ -62,7 +63,8 @@ protected:
     // A strict mock: every unexpected call is a failure.
     std::shared_ptr<StrictMock<MockProtocol>> protocol = std::make_shared<StrictMock<MockProtocol>>();
     std::shared_ptr<support::FakeConnection> connection = std::make_shared<support::FakeConnection>(7);
-    client::ServiceProtocolAdapter adapter{protocol};
+    ledger::Ledger ledger;
+    client::ServiceProtocolAdapter adapter{protocol, ledger};
 };
 
 // --- the meaning of a call
@@ -94,6 +96,11 @@ TEST_F(AdapterTest, CallsEachOperationByItsNumberWithItsArgumentsInOrder)
     accept({9, 9, 42});
     accept({10, 10});
     accept({11, 11});
+    for (const client::ServiceOperation& operation : client::serviceOperations) {
+        const auto counter = ledger::counterOf("calls." + std::string(operation.name()));
+        ASSERT_TRUE(counter) << operation.name();
+        EXPECT_EQ(ledger.account()[*counter], 1U) << operation.name();
+    }
 }
 
 TEST_F(AdapterTest, TellsNoListFromAnEmptyOne)

@@ -260,6 +260,28 @@ TEST_F(SessionMessagesTest, TellWhetherTheyWereDropped)
     EXPECT_THAT(recorded().front(), record("Playback_Start_1", {{"a", 1}})) << "as given";
 }
 
+TEST_F(SessionMessagesTest, AreCountedByWhatBecameOfThem)
+{
+    using ledger::Counter;
+    platform.turn.tally.clear();
+    send(Dictionary{{"a", 1}});
+    send(Dictionary{{"a", 1}});
+    send(Dictionary{{"a", 2}});
+    const ledger::Tally& tally = platform.turn.tally;
+    EXPECT_EQ(tally[Counter::Deliveries], 3U);
+    EXPECT_EQ(tally[Counter::Recorded], 2U);
+    EXPECT_EQ(tally[Counter::Repeated], 1U);
+    session->stop(platform.turn); // with a summary
+    EXPECT_EQ(tally[Counter::Deliveries], 4U);
+    EXPECT_EQ(tally[Counter::Recorded], 3U);
+    EXPECT_EQ(tally[Counter::SessionsStopped], 1U);
+    session->stop(platform.turn);
+    EXPECT_EQ(tally[Counter::SessionsStopped], 1U);
+    send(Dictionary{{"a", 3}});
+    EXPECT_EQ(tally[Counter::Deliveries], 5U);
+    EXPECT_EQ(tally[Counter::Inert], 1U);
+}
+
 // --- outside a run
 
 TEST_F(SessionMessagesTest, ToASessionThatIsNotStartedAreNotRecorded)
@@ -313,8 +335,11 @@ TEST_F(SessionMessagesTest, AreHandledTheSameSynchronouslyOrNot)
 TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
 {
     support::TestPlatform platform;
-    const auto budget = std::make_shared<session::StorageBudget>(1024);
-    KestoReportingSession session(42, {7}, budget);
+    const auto budget = std::make_shared<session::StorageBudget>(1240);
+    const ledger::Culprit player{.user = 1000, .process = "player", .application = ""};
+    KestoReportingSession session(42, {7}, budget, player);
+    session.setConfiguration(Dictionary{{"HostApplicationDisplayID", "org.example.player"}});
+    const std::size_t ofConfiguration = budget->taken();
     session.start();
     const std::string large(600, 'x');
     session.sendMessage(platform.turn.tally, Dictionary{{"a", large}}, playback, start, nullptr);
@@ -327,11 +352,21 @@ TEST(SessionMemory, ThatIsUsedUpCostsMessagesAndIsSaidOnce)
                                 "no memory left for the messages of session 42; they are lost until sessions stop"))
                     .Times(1));
 
+    const ledger::Tally& tally = platform.turn.tally;
+    EXPECT_EQ(tally[ledger::Counter::Deliveries], 4U);
+    EXPECT_EQ(tally[ledger::Counter::Recorded], 1U);
+    EXPECT_EQ(tally[ledger::Counter::RefusedForMemory], 3U);
+    ASSERT_THAT(tally.charged(), SizeIs(1));
+    EXPECT_EQ(tally.charged()[0].culprit,
+              (ledger::Culprit{.user = 1000, .process = "player", .application = "org.example.player"}));
+    EXPECT_EQ(tally.charged()[0].count, 3U);
+
     platform.log.clear();
     session.stop(platform.turn);
+    EXPECT_EQ(platform.ledger.account()[ledger::Counter::SummariesLost], 1U);
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerr", "session 42 lost 4 messages for lack of memory")))
         << "its summary is the fourth";
-    EXPECT_EQ(budget->taken(), 0U);
+    EXPECT_EQ(budget->taken(), ofConfiguration);
 
     platform.log.clear();
     session.start();

@@ -35,7 +35,7 @@ public:
     FakeDeviceProperties deviceProperties;
     FakeProcessTable processTable;
     FakeNotifications notifications;
-    FakeAnalytics analytics;
+    FakeAnalytics analytics{ledger};
     FakeTraceEmitter traceEmitter;
     FakeReportingChannels reportingChannels;
     FakeBugCapture bugCapture;

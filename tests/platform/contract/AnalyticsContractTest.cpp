@@ -34,6 +34,8 @@ public:
     virtual void use(const std::string& pattern) = 0;
     // Does what the platform does at the end of a turn.
     virtual void end(platform::Turn&) { }
+    // What is counted, once everything is kept that was sent; of turns only what `end` took.
+    [[nodiscard]] virtual ledger::Account account() = 0;
     // The kept events, in order; this ends the service.
     [[nodiscard]] virtual std::vector<AnalyticsEvent> events() = 0;
 };
@@ -42,10 +44,13 @@ class FakeAnalyticsSubject final : public AnalyticsSubject {
 public:
     [[nodiscard]] platform::Analytics& analytics() override { return analytics_; }
     void use(const std::string& pattern) override { analytics_.use(pattern); }
+    void end(platform::Turn& turn) override { ledger_.post(turn.tally); }
+    [[nodiscard]] ledger::Account account() override { return ledger_.account(); }
     [[nodiscard]] std::vector<AnalyticsEvent> events() override { return analytics_.events(); }
 
 private:
-    support::FakeAnalytics analytics_;
+    ledger::Ledger ledger_;
+    support::FakeAnalytics analytics_{ledger_};
 };
 
 // The store of Linux, on any keeper of events.
@@ -65,6 +70,11 @@ public:
         configure();
     }
     void end(platform::Turn& turn) override { store_->endTurn(turn, nullptr); }
+    [[nodiscard]] ledger::Account account() override
+    {
+        store_->flush();
+        return ledger_.account();
+    }
     [[nodiscard]] std::vector<AnalyticsEvent> events() override
     {
         store_.reset(); // it keeps all of them first
@@ -183,6 +193,22 @@ TEST_P(AnalyticsContract, KeepsTheEventsOfATurnInTheirOrderOnceItIsOver)
     EXPECT_THAT(subject->events(),
                 ElementsAre(AnalyticsEvent{"com.quarn.a", {{"n", 1}}}, AnalyticsEvent{"com.quarn.a", {{"n", 2}}},
                             AnalyticsEvent{"com.quarn.a", {{"n", 3}}}, AnalyticsEvent{"com.quarn.a", {{"n", 4}}}));
+}
+
+TEST_P(AnalyticsContract, CountsWhatBecameOfEachEventAndHandsTheCountsOfATurnToItsEnd)
+{
+    want("com.quarn.a");
+    platform::Turn turn;
+    for (const char* name : {"com.quarn.a", "com.quarn.b", "com.quarn.a"})
+        subject->analytics().sendAnalyticsEventLazy(turn, name, [] { return Dictionary(); });
+    EXPECT_EQ(subject->account()[ledger::Counter::Events], 0U);
+    subject->end(turn);
+    send("com.quarn.a", {});
+    send("com.quarn.b", {});
+    const ledger::Account account = subject->account();
+    EXPECT_EQ(account[ledger::Counter::Events], 5U);
+    EXPECT_EQ(account[ledger::Counter::Kept], 3U);
+    EXPECT_EQ(account[ledger::Counter::Unwanted], 2U);
 }
 
 TEST_P(AnalyticsContract, BuildsAPayloadOnceAndLetsItsBuilderGo)

@@ -102,17 +102,27 @@ bool FakeAnalytics::isUsed(const std::string& name) const
 }
 
 // Events are stored immediately: only real stores delay the events of a turn, and their tests cover this.
-void FakeAnalytics::sendAnalyticsEventLazy(platform::Turn&, std::string_view eventName, PayloadBuilder payloadBuilder)
+void FakeAnalytics::sendAnalyticsEventLazy(platform::Turn& turn, std::string_view eventName,
+                                           PayloadBuilder payloadBuilder)
 {
-    sendAnalyticsEventLazy(platform::outsideTurn, eventName, std::move(payloadBuilder));
+    send(turn.tally, std::string(eventName), std::move(payloadBuilder));
 }
 
 void FakeAnalytics::sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view eventName,
                                            PayloadBuilder payloadBuilder)
 {
-    std::string name(eventName);
+    ledger::Tally tally;
+    send(tally, std::string(eventName), std::move(payloadBuilder));
+    ledger_.post(tally);
+}
+
+void FakeAnalytics::send(ledger::Tally& tally, std::string name, PayloadBuilder payloadBuilder)
+{
     const foundation::Lock lock(lock_);
-    if (isUsed(name))
+    const bool isWanted = isUsed(name);
+    tally.add(ledger::Counter::Events);
+    tally.add(isWanted ? ledger::Counter::Kept : ledger::Counter::Unwanted);
+    if (isWanted)
         sent_.push_back({std::move(name), std::move(payloadBuilder), std::nullopt});
 }
 

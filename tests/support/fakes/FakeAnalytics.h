@@ -3,6 +3,7 @@
 #pragma once
 
 #include "foundation/Mutex.h"
+#include "ledger/Ledger.h"
 #include "platform/Analytics.h"
 #include "support/PrintValues.h"
 
@@ -24,6 +25,9 @@ void PrintTo(const AnalyticsEvent& event, std::ostream* out);
 // Any thread.
 class FakeAnalytics final : public platform::Analytics {
 public:
+    // The ledger counts the events outside turns; the turns count their own.
+    explicit FakeAnalytics(ledger::Ledger& ledger) : ledger_(ledger) { }
+
     // From now on events with a name that matches the glob are wanted; at first none are.
     void use(std::string pattern);
 
@@ -56,8 +60,10 @@ private:
         PayloadBuilder builder;
         std::optional<foundation::Dictionary> payload;
     };
+    void send(ledger::Tally& tally, std::string name, PayloadBuilder payloadBuilder);
     [[nodiscard]] bool isUsed(const std::string& name) const KESTO_REQUIRES(lock_);
 
+    ledger::Ledger& ledger_;
     std::function<void(const std::string&)> observer_;
     mutable foundation::Mutex lock_;
     std::vector<std::string> used_ KESTO_GUARDED_BY(lock_);

@@ -2,6 +2,7 @@
 // once, and the background queue at most as many as it has threads.
 #include "support/fakes/FakeWorkQueues.h"
 
+#include "platform/Platform.h"
 #include "platform/Turn.h"
 
 #include <algorithm>
@@ -97,6 +98,8 @@ bool FakeWorkQueues::runOne()
         item.work(turn);
         item.work = nullptr; // released on its queue
     }
+    if (platform::isInstalled())
+        platform::current().ledger.post(turn.tally);
     if (auto send = turn.letters.take())
         send();
     return true;

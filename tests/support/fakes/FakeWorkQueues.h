@@ -2,7 +2,8 @@
 // in which they were submitted, and delayed work when virtual time reaches it.
 //
 // The promises of a real serial queue hold here too: while one of its items waits for a semaphore, other queues go on
-// and this one does not. Each item is a turn of its own; what it sent leaves after it.
+// and this one does not. Each item is a turn of its own; what it sent leaves after it, when its counts are in the
+// ledger of the installed platform.
 #pragma once
 
 #include "platform/WorkQueue.h"
