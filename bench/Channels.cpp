@@ -135,7 +135,8 @@ void measureSampling(const BenchOptions& options, Report& report)
 {
     const InProcessPlatform platform;
     const ChannelRoot root;
-    platform::LinuxReportingChannels channels(root.path(), "/nowhere", platform::ProviderLog(platform::current().log));
+    platform::LinuxReportingChannels channels(root.path(), "/nowhere", platform::current().ledger,
+                                              platform::ProviderLog(platform::current().log));
     publishAll(root.path(), 1);
     const auto subscribed =
         channels.createSubscription(*channels.copyChannelsInGroup("Speaker", std::nullopt).channels);

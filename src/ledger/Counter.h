@@ -84,9 +84,12 @@ enum class Counter : std::uint8_t {
 
     ChannelsLeftOut,
     CapturesTaken,
+    CapturesFailed,
     CapturesRefused,
     CapturesEvicted,
     TraceEventsLost,
+    TraceIntervalsLost,
+    TracePointsLost,
     LogLinesLost
 };
 inline constexpr std::size_t counterCount = static_cast<std::size_t>(Counter::LogLinesLost) + 1;

@@ -23,6 +23,8 @@ Ledger::Ledger(LedgerImage& image) : image_(image)
 
 void Ledger::count(Counter counter, std::uint64_t number) noexcept
 {
+    if (number == 0)
+        return;
     std::atomic_ref(image_.live[static_cast<std::size_t>(counter)]).fetch_add(number, std::memory_order_relaxed);
     reportChange();
 }

@@ -41,6 +41,10 @@ void TraceRunner::writeQuilldat()
 // Readers of the file check these remarks before they rely on its records.
 void TraceRunner::remarkWhatIsMissing()
 {
+    ledger::Ledger& ledger = platform::current().ledger;
+    ledger.count(ledger::Counter::TraceEventsLost, lostEvents_);
+    ledger.count(ledger::Counter::TraceIntervalsLost, lostIntervals_);
+    ledger.count(ledger::Counter::TracePointsLost, lostPoints_);
     perfWriter_->remark("lostEvents", lostEvents_);
     perfWriter_->remark("lostIntervals", lostIntervals_);
     perfWriter_->remark("lostPoints", lostPoints_);

@@ -57,7 +57,8 @@ protected:
     const support::TemporaryDirectory directory;
     const fs::path root = directory.path() / "channels";
     support::TestPlatform fakes;
-    platform::LinuxReportingChannels channels{root, directory.path() / "asound", platform::ProviderLog(fakes.log)};
+    platform::LinuxReportingChannels channels{root, directory.path() / "asound", fakes.ledger,
+                                              platform::ProviderLog(fakes.log)};
     std::shared_ptr<KestoReportingSession> session =
         std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
     std::optional<KestoReportingDriverUtility> utility;

@@ -92,6 +92,7 @@ TEST_F(RunnerResults, SayHowManyEventsTheTracesLost)
     emit(5);
     platform.kernelTrace.lose(1000);
     runner->stopTracingandProcessResults();
+    EXPECT_EQ(platform.ledger.account()[ledger::Counter::TraceEventsLost], 2000U);
     EXPECT_EQ(file().remarks, (Remarks{{"lostEvents", 2000}, {"lostIntervals", 0}, {"lostPoints", 0}}));
 }
 
@@ -106,6 +107,7 @@ TEST_F(RunnerResults, SayHowManyIntervalsWereNotMeasured)
     runner->stopTracingandProcessResults();
     // Each has 50,000 results, and reads 100,000 events.
     EXPECT_EQ(file().remarks, (Remarks{{"lostEvents", 0}, {"lostIntervals", 580}, {"lostPoints", 0}}));
+    EXPECT_EQ(platform.ledger.account()[ledger::Counter::TraceIntervalsLost], 580U);
 }
 
 TEST_F(RunnerResults, SayWhatOfTheParametersWasNotRead)
@@ -117,6 +119,7 @@ TEST_F(RunnerResults, SayWhatOfTheParametersWasNotRead)
     platform.kernelTrace.startError = 24;
     runner->runTraces();
     runner->stopTracingandProcessResults();
+    EXPECT_EQ(platform.ledger.account()[ledger::Counter::TracePointsLost], 7U);
     EXPECT_EQ(file().remarks,
               (Remarks{{"lostEvents", 0},
                        {"lostIntervals", 0},

@@ -34,14 +34,16 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       deviceSettings_(configurationWatcher_, ProviderLog(log_)),
       folderLimits_(workQueues_, ProviderLog(log_)),
       fileSystem_(launch.logsDirectory, &folderLimits_),
-      reportingChannels_(launch.channelRoot, launch.soundRoot, ProviderLog(log_)),
-      bugCapture_(launch.stateDirectory, {.log = log_.recentLines(), .clock = clock_, .workQueues = workQueues_},
+      reportingChannels_(launch.channelRoot, launch.soundRoot, ledger_, ProviderLog(log_)),
+      bugCapture_(launch.stateDirectory,
+                  {.log = log_.recentLines(), .clock = clock_, .workQueues = workQueues_, .ledger = ledger_},
                   ProviderLog(log_)),
       kernelTrace_(TracefsPlace(), traceEmitter_, emitterAccess_, ProviderLog(log_)),
       performanceWriter_(fileSystem_, ProviderLog(log_)),
       analytics_(std::make_unique<SqliteKeeper>(launch.stateDirectory, clock_, ProviderLog(log_)),
                  configurationWatcher_, clock_, ledger_, ProviderLog(log_))
 {
+    log_.setLedger(ledger_);
     preferences_.setChangeHandler([this](std::string_view domain) { notifications_.post(notificationOf(domain)); });
     // The replies of a turn leave once its events are kept.
     workQueues_.setTurnEndHandler([this](Turn& turn) { analytics_.endTurn(turn, turn.letters.take()); });

@@ -92,10 +92,14 @@ private:
     support::FakeClock clock_;
     support::FakeWorkQueues queues_{clock_};
     platform::LinuxLog log_{platform::LogThresholds(), {.journalSocket = {}, .descriptor = -1}};
-    platform::LinuxBugCapture capture_{
-        directory_.path(),
-        {.log = log_.recentLines(), .clock = clock_, .workQueues = queues_, .proc = directory_ / "proc"},
-        platform::ProviderLog(log_)};
+    ledger::Ledger ledger_;
+    platform::LinuxBugCapture capture_{directory_.path(),
+                                       {.log = log_.recentLines(),
+                                        .clock = clock_,
+                                        .workQueues = queues_,
+                                        .ledger = ledger_,
+                                        .proc = directory_ / "proc"},
+                                       platform::ProviderLog(log_)};
 };
 
 class BugCaptureContract : public Suite<BugCaptureSubject> {

@@ -97,7 +97,8 @@ private:
     const support::TemporaryDirectory directory_;
     const std::filesystem::path root_ = directory_ / "channels";
     support::FakeLog log_;
-    platform::LinuxReportingChannels channels_{root_, directory_ / "asound", platform::ProviderLog(log_)};
+    ledger::Ledger ledger_;
+    platform::LinuxReportingChannels channels_{root_, directory_ / "asound", ledger_, platform::ProviderLog(log_)};
 };
 
 ReportingChannel channel(ChannelFormat format, std::string name)

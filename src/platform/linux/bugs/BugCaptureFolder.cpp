@@ -206,7 +206,7 @@ std::expected<std::string, std::error_code> BugCaptureFolder::nextName(double ti
 }
 
 // Makes room for one more capture, with so many bytes of state.
-void BugCaptureFolder::makeRoom(int folder, std::uint64_t bytes) const
+void BugCaptureFolder::makeRoom(int folder, std::uint64_t bytes)
 {
     const std::vector<Capture> captures = capturesIn(folder);
     std::vector<std::uint64_t> bulks;
@@ -219,11 +219,12 @@ void BugCaptureFolder::makeRoom(int folder, std::uint64_t bytes) const
         if (!capture.bulk || tooMany == 0)
             continue;
         --tooMany;
+        ++removed_;
         if (const auto opened = openDirectoryAt(folder, capture.name))
             remove(opened->get(), stateName, folder);
     }
     const std::size_t most = std::max<std::size_t>(limits_.mostCaptures, 1) - 1;
-    for (std::size_t oldest = 0; captures.size() - oldest > most; ++oldest)
+    for (std::size_t oldest = 0; captures.size() - oldest > most; ++oldest, ++removed_)
         remove(folder, captures[oldest].name, folder);
 }
 

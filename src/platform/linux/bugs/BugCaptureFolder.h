@@ -20,6 +20,7 @@
 #include <optional>
 #include <string>
 #include <system_error>
+#include <utility>
 #include <vector>
 
 namespace platform {
@@ -60,6 +61,9 @@ public:
     [[nodiscard]] std::error_code add(const std::string& name, const std::vector<File>& files,
                                       const std::vector<File>& state);
 
+    // How many captures were removed, wholly or but for a tombstone, since the last call.
+    [[nodiscard]] std::size_t takeRemoved() noexcept { return std::exchange(removed_, 0); }
+
 private:
     struct Capture;
     [[nodiscard]] std::expected<FileDescriptor, std::error_code> openStateDirectory() const;
@@ -69,13 +73,14 @@ private:
     [[nodiscard]] static std::vector<Capture> capturesIn(int folder);
     [[nodiscard]] std::uint64_t lastNumber() const;
     [[nodiscard]] std::error_code keepLastNumber(std::uint64_t number) const;
-    void makeRoom(int folder, std::uint64_t bytes) const;
+    void makeRoom(int folder, std::uint64_t bytes);
     [[nodiscard]] std::error_code write(int folder, const std::string& hidden, const std::vector<File>& files,
                                         const std::vector<File>& state) const;
 
     const std::filesystem::path stateDirectory_;
     const std::filesystem::path path_;
     const Limits limits_;
+    std::size_t removed_ = 0;
 };
 
 } // namespace platform

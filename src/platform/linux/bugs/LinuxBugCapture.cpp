@@ -65,13 +65,7 @@ std::unique_ptr<BugCaptureReporter> LinuxBugCapture::makeReporter()
     return std::make_unique<Reporter>(*this);
 }
 
-std::uint64_t LinuxBugCapture::refusedSnapshots() const
-{
-    const foundation::Lock lock(lock_);
-    return refused_;
-}
-
-// Whether a snapshot may be taken now; counts the snapshot or the refusal.
+// Whether a snapshot may be taken now; counts the refusal.
 bool LinuxBugCapture::admit()
 {
     const double now = sources_.clock.systemUptime();
@@ -80,7 +74,7 @@ bool LinuxBugCapture::admit()
         admitted_.pop_front();
     const bool isTooMuch = std::max(admitted_.size(), waiting_.size()) >= limits_.mostAtOnce;
     if (isTooMuch)
-        ++refused_;
+        sources_.ledger.count(ledger::Counter::CapturesRefused);
     else
         admitted_.push_back(now);
     return !isTooMuch;
@@ -123,6 +117,8 @@ void LinuxBugCapture::takeNext()
 Dictionary LinuxBugCapture::capture(const Request& request)
 {
     const auto name = write(request);
+    sources_.ledger.count(name ? ledger::Counter::CapturesTaken : ledger::Counter::CapturesFailed);
+    sources_.ledger.count(ledger::Counter::CapturesEvicted, folder_.takeRemoved());
     if (!name) {
         log_.error("a bug was not captured in {}: {}", folder_.path().native(), name.error());
         return refusal(name.error());
@@ -164,7 +160,7 @@ std::vector<BugCaptureFolder::File> LinuxBugCapture::stateAt(double time, const 
                            {"event", request.event},
                            {"payload", request.payload},
                            {"sender", request.sender == 0 ? Value() : Value(request.sender)},
-                           {"refusedBefore", refusedSnapshots()}};
+                           {"refusedBefore", sources_.ledger.sinceStart()[ledger::Counter::CapturesRefused]}};
     return {{"request.json", jsonOf(asked)},
             {"log.txt", sources_.log.text()},
             {"processes.json",

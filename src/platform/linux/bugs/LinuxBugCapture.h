@@ -12,6 +12,7 @@
 #pragma once
 
 #include "foundation/Mutex.h"
+#include "ledger/Ledger.h"
 #include "platform/BugCapture.h"
 #include "platform/Clock.h"
 #include "platform/WorkQueue.h"
@@ -44,6 +45,7 @@ public:
         const RecentLogLines& log;
         const Clock& clock;
         WorkQueues& workQueues;
+        ledger::Ledger& ledger;
         std::filesystem::path proc = "/proc"; // processes and the sound system
     };
 
@@ -57,9 +59,6 @@ public:
 
     [[nodiscard]] std::unique_ptr<BugCaptureReporter> makeReporter() override;
     void setStateDescription(const StateDescription& describe) override { describeState_ = describe; }
-
-    // How many requests were refused since the start, because they came too soon after others.
-    [[nodiscard]] std::uint64_t refusedSnapshots() const;
 
 private:
     class Reporter;
@@ -93,7 +92,6 @@ private:
     std::deque<Request> waiting_ KESTO_GUARDED_BY(lock_);
     bool isTaking_ KESTO_GUARDED_BY(lock_) = false;
     std::deque<double> admitted_ KESTO_GUARDED_BY(lock_); // the uptimes of the last accepted requests
-    std::uint64_t refused_ KESTO_GUARDED_BY(lock_) = 0;
 };
 
 } // namespace platform

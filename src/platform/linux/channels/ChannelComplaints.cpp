@@ -52,6 +52,7 @@ void ChannelComplaints::logProblems(const std::vector<ChannelProblem>& problems)
         if (++count <= mostNamed)
             log_.error("channel {} is left out: {}", problem.path, problem.reason);
     }
+    ledger_.count(ledger::Counter::ChannelsLeftOut, count);
     if (count > mostNamed)
         log_.error("{} more channels are left out", count - mostNamed);
 }
@@ -62,6 +63,8 @@ void ChannelComplaints::logLeftOut(LeftOutChannels leftOut) const
          {&LeftOutChannels::beyondChannels, &LeftOutChannels::beyondBytes, &LeftOutChannels::beyondNames})
         if (anyRemembers([&](const Findings& each) { return each.leftOut.*bound > 0; }))
             leftOut.*bound = 0;
+        else
+            ledger_.count(ledger::Counter::ChannelsLeftOut, leftOut.*bound);
     for (const std::string& line : leftOut.inWords(limits_))
         log_.error("{}", line);
 }

@@ -4,6 +4,7 @@
 #pragma once
 
 #include "foundation/Mutex.h"
+#include "ledger/Ledger.h"
 #include "platform/linux/channels/ChannelTree.h"
 #include "platform/linux/log/ProviderLog.h"
 
@@ -28,16 +29,18 @@ public:
     // The last findings of one query. Its owner keeps it as long as the query may be repeated.
     using Memory = std::shared_ptr<Findings>;
 
-    ChannelComplaints(std::filesystem::path root, const ChannelTree::Limits& limits, ProviderLog log)
+    ChannelComplaints(std::filesystem::path root, const ChannelTree::Limits& limits, ledger::Ledger& ledger,
+                      ProviderLog log)
         : root_(std::move(root)),
           limits_(limits),
+          ledger_(ledger),
           log_(log)
     {
     }
 
     // Adds a query, which has no findings yet.
     [[nodiscard]] Memory addQuery();
-    // Logs the new findings, and keeps all.
+    // Logs and counts the new findings, and keeps all.
     void report(Findings found, const Memory& memory);
     // Logs that the tree could not be read, and keeps its earlier findings until it can be read.
     void reportUnreadable(std::error_code error, const Memory& memory);
@@ -51,6 +54,7 @@ private:
 
     const std::filesystem::path root_;
     const ChannelTree::Limits limits_;
+    ledger::Ledger& ledger_;
     const ProviderLog log_;
     foundation::Mutex lock_;
     std::vector<Memory> memories_ KESTO_GUARDED_BY(lock_);

@@ -18,11 +18,11 @@ namespace platform {
 // One thread at a time for each set of channels; otherwise any. Error codes are the system's (`errno`).
 class LinuxReportingChannels final : public ReportingChannels {
 public:
-    LinuxReportingChannels(const std::filesystem::path& channelRoot, std::filesystem::path soundRoot, ProviderLog log,
-                           const ChannelTree::Limits& limits = {})
+    LinuxReportingChannels(const std::filesystem::path& channelRoot, std::filesystem::path soundRoot,
+                           ledger::Ledger& ledger, ProviderLog log, const ChannelTree::Limits& limits = {})
         : tree_(channelRoot, limits),
           soundCards_(std::move(soundRoot)),
-          complaints_(channelRoot, limits, log)
+          complaints_(channelRoot, limits, ledger, log)
     {
     }
 

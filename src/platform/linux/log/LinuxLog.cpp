@@ -111,7 +111,11 @@ void LinuxLog::write(const LogRecord& record)
     recentLines_.add(LinuxClock().secondsSince1970(), record.level, record.category.tag(), text);
     switch (journal_ ? sendToJournal(record, text) : Sent::NoJournal) {
     case Sent::Yes: reportLost(); break;
-    case Sent::Lost: ++lostLines_; break;
+    case Sent::Lost:
+        ++lostLines_;
+        if (ledger::Ledger* ledger = ledger_)
+            ledger->count(ledger::Counter::LogLinesLost);
+        break;
     case Sent::NoJournal:
         line.push_back('\n');
         writeToDescriptor({line.data(), line.size()});

@@ -9,6 +9,7 @@
 // protocol, or control a reader's terminal.
 #pragma once
 
+#include "ledger/Ledger.h"
 #include "platform/Log.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/log/LogThresholds.h"
@@ -46,6 +47,9 @@ public:
     // exist, lines go to the descriptor.
     void write(const LogRecord& record) override;
 
+    // Counts lost lines from now on.
+    void setLedger(ledger::Ledger& ledger) noexcept { ledger_ = &ledger; }
+
     // The last lines, for both destinations.
     [[nodiscard]] const RecentLogLines& recentLines() const noexcept { return recentLines_; }
 
@@ -62,7 +66,8 @@ private:
     FileDescriptor journal_; // empty without a journal
     sockaddr_un journalAddress_{};
     std::atomic<bool> journalIsBehind_ = false;
-    std::atomic<std::uint64_t> lostLines_ = 0;
+    std::atomic<std::uint64_t> lostLines_ = 0; // since the last line that reported them
+    std::atomic<ledger::Ledger*> ledger_ = nullptr;
     RecentLogLines recentLines_;
 };
 

@@ -39,7 +39,7 @@ protected:
 
     LinuxBugCapture::Sources sources()
     {
-        return {.log = log.recentLines(), .clock = clock, .workQueues = queues, .proc = proc};
+        return {.log = log.recentLines(), .clock = clock, .workQueues = queues, .ledger = ledger, .proc = proc};
     }
     Dictionary signature(BugCaptureReporter& reporter, std::string_view process = "player")
     {
@@ -71,6 +71,7 @@ protected:
     LinuxLog log{LogThresholds(), {.journalSocket = {}, .descriptor = -1}};
     support::FakeClock clock;
     support::FakeWorkQueues queues{clock};
+    ledger::Ledger ledger;
     std::vector<Dictionary> responses;
 };
 
@@ -205,6 +206,16 @@ TEST_F(LinuxBugCaptureTest, TakesOneSnapshotAfterTheOther)
     request(capture);
     queues.runAll();
     EXPECT_THAT(responses, SizeIs(4)) << "and begins again";
+    EXPECT_EQ(ledger.account()[ledger::Counter::CapturesTaken], 4U);
+}
+
+TEST_F(LinuxBugCaptureTest, CountsTheSnapshotsThatMakeRoomForLaterOnes)
+{
+    LinuxBugCapture capture(state, sources(), ProviderLog(log), {.folder = {.mostCaptures = 2}});
+    for (int each = 0; each < 5; ++each)
+        request(capture);
+    queues.runAll();
+    EXPECT_EQ(ledger.account()[ledger::Counter::CapturesEvicted], 3U);
 }
 
 TEST_F(LinuxBugCaptureTest, RefusesSnapshotsThatComeTooThick)
@@ -216,7 +227,7 @@ TEST_F(LinuxBugCaptureTest, RefusesSnapshotsThatComeTooThick)
     queues.runAll();
     EXPECT_THAT(responses, SizeIs(5)) << "each is answered";
     EXPECT_EQ(std::ranges::count_if(responses, succeeded), 2);
-    EXPECT_EQ(capture.refusedSnapshots(), 3U);
+    EXPECT_EQ(ledger.account()[ledger::Counter::CapturesRefused], 3U);
     EXPECT_EQ(std::ranges::count(
                   responses,
                   Dictionary{{"success", false}, {"reason", "too many snapshots were asked for: wait some minutes"}}),
@@ -244,7 +255,7 @@ TEST_F(LinuxBugCaptureTest, RefusesSnapshotsWhileAsManyWaitForTheDiskHoweverLong
     request(capture);
     queues.runAll();
     EXPECT_EQ(std::ranges::count_if(responses, succeeded), 2);
-    EXPECT_EQ(capture.refusedSnapshots(), 1U);
+    EXPECT_EQ(ledger.account()[ledger::Counter::CapturesRefused], 1U);
     request(capture);
     queues.runAll();
     EXPECT_EQ(std::ranges::count_if(responses, succeeded), 3) << "none waits any more";
@@ -269,6 +280,8 @@ TEST_F(LinuxBugCaptureTest, LeavesTheDiskToOthersWhenThereIsLittleRoom)
     queues.runAll();
     EXPECT_THAT(responses,
                 ElementsAre(Dictionary{{"success", false}, {"reason", "less than 1099511627776 MiB are free"}}));
+    EXPECT_EQ(ledger.account()[ledger::Counter::CapturesFailed], 1U);
+    EXPECT_EQ(ledger.account()[ledger::Counter::CapturesTaken], 0U);
     EXPECT_FALSE(fs::exists(captures)) << "this is checked first";
     EXPECT_THAT(log.recentLines().text(), HasSubstr("a bug was not captured in " + captures.native()));
 }

@@ -48,7 +48,8 @@ protected:
     const fs::path root = directory.path() / "channels";
     const fs::path sound = directory.path() / "asound";
     support::FakeLog log;
-    LinuxReportingChannels channels{root, sound, ProviderLog(log)};
+    ledger::Ledger ledger;
+    LinuxReportingChannels channels{root, sound, ledger, ProviderLog(log)};
 };
 
 TEST_F(LinuxReportingChannelsTest, AreMissingOnADeviceWithoutPublishers)
@@ -132,13 +133,14 @@ TEST_F(LinuxReportingChannelsTest, NameTheBoundThatASampleMet)
                                    "that it takes")));
     EXPECT_THAT(sample(subscribed).channels, SizeIs(fitting));
     EXPECT_THAT(log.take(), IsEmpty()) << "once";
+    EXPECT_EQ(ledger.account()[ledger::Counter::ChannelsLeftOut], 2U);
 
-    LinuxReportingChannels few(root, sound, ProviderLog(log), {.channels = 10});
+    LinuxReportingChannels few(root, sound, ledger, ProviderLog(log), {.channels = 10});
     EXPECT_EQ(few.channelCount(*few.copyChannelsInGroup("Speaker", std::nullopt).channels), 10U);
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(Error, "kerl", "channels left out of a sample: 62, beyond the 10 that it takes")));
 
-    LinuxReportingChannels blind(root, sound, ProviderLog(log), {.names = 4});
+    LinuxReportingChannels blind(root, sound, ledger, ProviderLog(log), {.names = 4});
     EXPECT_EQ(blind.channelCount(*blind.copyChannelsInGroup("Speaker", std::nullopt).channels), 0U);
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(Error, "kerl",
@@ -153,7 +155,7 @@ TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
     fs::create_directory_symlink(directory.path(), root / "link");
     for (const char* name : {"a", "b", "c", "d", "e"})
         publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
-    LinuxReportingChannels bounded(root, sound, ProviderLog(log), {.names = 15});
+    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.names = 15});
     std::vector<ReportingChannels::Subscribed> subscribed;
     for (const auto& [group, subgroup] : std::vector<std::pair<Name, Name>>{
              {"QuarnZT4", {}}, {"Speaker", {}}, {{}, "MCA"}, {"Haptics", "Stats"}, {"Rx", {}}, {{}, "HwAudio2"}})
@@ -164,6 +166,7 @@ TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
         IsLine(Error, "kerl",
                "folders left out of a sample, in part or whole: at least 1, beyond the 15 names that it looks at")};
     EXPECT_THAT(log.take(), ElementsAreArray(wrong));
+    EXPECT_EQ(ledger.account()[ledger::Counter::ChannelsLeftOut], 2U) << "the link, and at least one folder";
     ASSERT_THAT(subscribed, SizeIs(2));
     const auto sampleAll = [&] {
         for (const auto& each : subscribed)

@@ -259,6 +259,8 @@ TEST_F(LinuxLogJournalTest, AJournalThatIsBehindLosesLinesAndIsToldHowMany)
 {
     listen();
     LinuxLog log(LogThresholds(), {.journalSocket = path, .descriptor = fallback.get()});
+    ledger::Ledger ledger;
+    log.setLedger(ledger);
     // Without a reader the queue of datagrams, or the room for them, fills up.
     constexpr int written = 3000;
     const std::string message(1000, 'x');
@@ -268,6 +270,7 @@ TEST_F(LinuxLogJournalTest, AJournalThatIsBehindLosesLinesAndIsToldHowMany)
     while (nextDatagram())
         ++received;
     ASSERT_LT(received, written);
+    EXPECT_EQ(ledger.account()[ledger::Counter::LogLinesLost], static_cast<std::uint64_t>(written - received));
 
     log.write(record("room again"));
     EXPECT_THAT(nextDatagram().value_or(""), HasSubstr("room again"));
