@@ -174,6 +174,26 @@ std::vector<StoreRow> Kestod::events(std::string_view pattern) const
     return *std::move(events);
 }
 
+std::uint64_t Kestod::eventCount() const
+{
+    const fs::path path = directory() / "state" / "analytics.sqlite3";
+    sqlite3* database = nullptr;
+    sqlite3_stmt* query = nullptr;
+    std::optional<std::uint64_t> count;
+    if (sqlite3_open_v2(path.c_str(), &database, SQLITE_OPEN_READONLY, nullptr) == SQLITE_OK) {
+        sqlite3_busy_timeout(database, 10'000);
+        if (sqlite3_prepare_v2(database, "SELECT count(*) FROM events", -1, &query, nullptr) == SQLITE_OK
+            && sqlite3_step(query) == SQLITE_ROW)
+            count = static_cast<std::uint64_t>(sqlite3_column_int64(query, 0));
+    }
+    const std::string problem = sqlite3_errmsg(database);
+    sqlite3_finalize(query);
+    sqlite3_close(database);
+    if (!count)
+        throw std::runtime_error("the store cannot be read: " + problem);
+    return *count;
+}
+
 std::vector<StoreRow> Kestod::waitForEvents(std::string_view pattern) const
 {
     waitUntil([&] { return !readEvents(pattern).value_or(std::vector<StoreRow>()).empty(); }); // no store exists yet

@@ -82,6 +82,8 @@ public:
 
     // The stored events of names that match the pattern (GLOB), in order. Throws if the store cannot be read.
     [[nodiscard]] std::vector<StoreRow> events(std::string_view pattern = "*") const;
+    // How many events the store holds. Throws if it cannot be read.
+    [[nodiscard]] std::uint64_t eventCount() const;
     // Waits for such an event.
     [[nodiscard]] std::vector<StoreRow> waitForEvents(std::string_view pattern) const;
 
