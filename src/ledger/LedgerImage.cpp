@@ -146,10 +146,10 @@ void LedgerImage::add(const Tally& tally, const std::optional<StoreState>& state
         slot.counts = newest.counts;
         slot.store = state.value_or(newest.store);
         std::uint64_t change = 0;
-        for (std::size_t place = 0; place < counterCount; ++place) {
+        tally.forEachTouched([&](std::size_t place) {
             slot.counts[place] += tally.counts()[place];
             change += tally.counts()[place] * weight(place);
-        }
+        });
         if (state)
             change += weightedSum(*state, placeOfStore) - weightedSum(newest.store, placeOfStore);
         slot.checksum = newest.checksum + change + weightOfSequence;

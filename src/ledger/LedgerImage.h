@@ -21,6 +21,8 @@ struct StoreState {
     std::uint64_t events = 0;
     std::uint64_t bytes = 0; // of its files
     double oldest = 0; // of its events: seconds since 1970, or 0
+
+    friend bool operator==(const StoreState&, const StoreState&) = default;
 };
 
 inline constexpr std::size_t culpritsKept = 10; // the largest of each charge

@@ -26,23 +26,17 @@ void Tally::charge(Charge charge, const Culprit& culprit, std::uint64_t count)
 
 void Tally::takeFrom(Tally& other)
 {
-    if (other.isEmpty_)
-        return;
-    for (std::size_t place = 0; place < counterCount; ++place)
-        counts_[place] += other.counts_[place];
+    other.forEachTouched([&](std::size_t place) { add(static_cast<Counter>(place), other.counts_[place]); });
     for (const auto& [kind, culprit, count] : other.charged_)
         charge(kind, culprit, count);
-    isEmpty_ = false;
     other.clear();
 }
 
 void Tally::clear()
 {
-    if (isEmpty_)
-        return;
-    counts_ = {};
+    forEachTouched([this](std::size_t place) { counts_[place] = 0; });
+    touched_ = {};
     charged_.clear();
-    isEmpty_ = true;
 }
 
 } // namespace ledger

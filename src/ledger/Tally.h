@@ -6,6 +6,7 @@
 #include "ledger/Culprit.h"
 
 #include <array>
+#include <bit>
 #include <cstdint>
 #include <span>
 #include <vector>
@@ -26,8 +27,9 @@ public:
 
     void add(Counter counter, std::uint64_t count = 1) noexcept
     {
-        counts_[static_cast<std::size_t>(counter)] += count;
-        isEmpty_ = false;
+        const auto place = static_cast<std::size_t>(counter);
+        counts_[place] += count;
+        touched_[place / 64] |= std::uint64_t{1} << place % 64;
     }
     // Adds to a counter that has a charge, and to what the culprit is charged with.
     void add(Counter counter, const Culprit& culprit, std::uint64_t count = 1);
@@ -35,7 +37,14 @@ public:
     void takeFrom(Tally& other);
     void clear();
 
-    [[nodiscard]] bool empty() const noexcept { return isEmpty_; }
+    [[nodiscard]] bool empty() const noexcept { return (touched_[0] | touched_[1]) == 0; }
+    // Calls `visit` with the place of each counter that something was added to. A turn touches few of them.
+    template <typename Visit> void forEachTouched(Visit visit) const
+    {
+        for (std::size_t word = 0; word < touched_.size(); ++word)
+            for (std::uint64_t bits = touched_[word]; bits != 0; bits &= bits - 1)
+                visit(64 * word + static_cast<std::size_t>(std::countr_zero(bits)));
+    }
     [[nodiscard]] std::uint64_t operator[](Counter counter) const noexcept
     {
         return counts_[static_cast<std::size_t>(counter)];
@@ -48,7 +57,8 @@ private:
 
     Counts counts_ = {};
     std::vector<Charged> charged_;
-    bool isEmpty_ = true;
+    std::array<std::uint64_t, 2> touched_ = {}; // a bit for each counter
+    static_assert(counterCount <= 128);
 };
 
 } // namespace ledger

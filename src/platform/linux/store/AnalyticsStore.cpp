@@ -190,7 +190,9 @@ void AnalyticsStore::post(ledger::Tally& tally)
     const auto state = keeper_->state();
     if (state)
         settle(tally, state->events);
-    ledger_.post(tally, state);
+    if (!tally.empty() || state != lastState_)
+        ledger_.post(tally, state);
+    lastState_ = state;
 }
 
 // The keeper's place may hold other events than the ledger counted: those that were committed when the service was
@@ -199,9 +201,9 @@ void AnalyticsStore::post(ledger::Tally& tally)
 void AnalyticsStore::settle(ledger::Tally& tally, std::uint64_t stored)
 {
     storedByLedger_ += tally[Counter::Kept];
-    for (const ledger::CounterRow& row : ledger::counterRows())
-        if (ledger::chargeOf(row.counter) == ledger::Charge::Removed)
-            storedByLedger_ -= tally[row.counter];
+    for (const Counter removed :
+         {Counter::RemovedForAge, Counter::RemovedForSize, Counter::RemovedForShare, Counter::RemovedByDamage})
+        storedByLedger_ -= tally[removed];
     if (stored > storedByLedger_) {
         tally.add(Counter::Events, stored - storedByLedger_);
         tally.add(Counter::Kept, stored - storedByLedger_);

@@ -106,6 +106,7 @@ private:
     const Limits limits_;
     UsedEventNames names_;
     const std::unique_ptr<EventKeeper> keeper_; // only for the store's thread, as the next
+    std::optional<ledger::StoreState> lastState_;
     std::uint64_t storedByLedger_; // the events that are in the store according to the ledger
 
     foundation::Mutex lock_;
