@@ -134,6 +134,7 @@ private:
         [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
         void sendAnalyticsEventLazy(platform::Turn&, std::string_view, PayloadBuilder) override { }
         void sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view, PayloadBuilder) override { }
+        void reportLosses() override { }
     };
     class TraceEmitter final : public platform::TraceEmitter {
         void emit(std::uint32_t, const std::array<std::uint64_t, 4>&) override { }

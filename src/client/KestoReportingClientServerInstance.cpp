@@ -2,13 +2,14 @@
 #include "client/KestoReportingClientServerInstance.h"
 
 #include "foundation/text/Format.h"
+#include "platform/Connection.h"
 #include "platform/Platform.h"
+#include "utility/EndProcess.h"
 #include "utility/KestoReportingUtility.h"
 #include "utility/ServerQueue.h"
 #include "utility/ServiceTraceCodes.h"
 
 #include <algorithm>
-#include <cstdlib>
 
 using ledger::Counter;
 
@@ -293,9 +294,14 @@ void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
 
 void KestoReportingClientServerInstance::killService(SuccessReply)
 {
+    const platform::Connection* caller = platform::Connection::current();
+    const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
+    KESTO_LOG(KestoReportingClientCategory(), Default, "{} asks the service to end: {}",
+              KestoReportingUtilityProcessNameForPID(sender).value_or("(null)"),
+              caller != nullptr ? caller->description() : foundation::format("process {}", sender));
     KESTO_LOG(KestoReportingClientCategory(), Default, "DESTROYING SERVICE");
     constexpr int exitStatus = 2;
-    std::_Exit(exitStatus); // immediately, because other threads are running; acknowledged events are kept already
+    utility::endProcess(exitStatus);
 }
 
 void KestoReportingClientServerInstance::handleConnectionError()

@@ -42,6 +42,8 @@ constexpr std::array<CounterRow, counterCount> makeRows()
         {LostNotJson, "lost.notJson", Loss, "their payloads hold NaN or infinity, which JSON cannot express",
          "correct the programs that send them"},
         {LostToOther, "lost.other", Loss, "SQLite refused", "restart the service and report this"},
+        {LostToEnd, "lost.end", Loss, "the service had no time left to store them when it ended",
+         "look for a disk that is slow or hangs"},
         {RemovedForAge, "removed.age", Limit, "older than maximum_age_days",
          "raise maximum_age_days in analytics.toml"},
         {RemovedForSize, "removed.size", Limit, "the store reached maximum_size_mb",
@@ -77,6 +79,8 @@ constexpr std::array<CounterRow, counterCount> makeRows()
         {CallsKillService, "calls.killService", Work, "", ""},
         {CallsTrace, "calls.trace", Work, "", ""},
         {CallsStatus, "calls.status", Work, "", ""},
+        {CallsLostToEnd, "calls.lost.end", Loss, "the service had no time left to carry them out when it ended",
+         "end the programs that send much before the service"},
 
         {SessionsCreated, "sessions.created", Work, "", ""},
         {SessionsRefused, "sessions.refused", Loss, "a client, or all of them, had too many sessions",
@@ -109,6 +113,8 @@ constexpr std::array<CounterRow, counterCount> makeRows()
         {TracePointsLost, "traces.lostPoints", Loss, "a trace's parameters named too many traces and points",
          "let the trace's parameters name fewer points"},
         {LogLinesLost, "log.lostLines", Limit, "the journal did not take them in time", "let the service log less"},
+        {WorkLostToEnd, "work.lost.end", Loss, "the service had no time left for background work when it ended",
+         "look for a disk that is slow or hangs"},
     }};
 }
 constexpr auto rows = makeRows();

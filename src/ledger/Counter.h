@@ -42,6 +42,7 @@ enum class Counter : std::uint8_t {
     LostToReader,
     LostNotJson,
     LostToOther,
+    LostToEnd,
     RemovedForAge,
     RemovedForSize,
     RemovedForShare,
@@ -71,6 +72,7 @@ enum class Counter : std::uint8_t {
     CallsKillService,
     CallsTrace,
     CallsStatus,
+    CallsLostToEnd, // with the ends of connections
 
     SessionsCreated,
     SessionsRefused,
@@ -90,9 +92,10 @@ enum class Counter : std::uint8_t {
     TraceEventsLost,
     TraceIntervalsLost,
     TracePointsLost,
-    LogLinesLost
+    LogLinesLost,
+    WorkLostToEnd // captures, and other work in the background
 };
-inline constexpr std::size_t counterCount = static_cast<std::size_t>(Counter::LogLinesLost) + 1;
+inline constexpr std::size_t counterCount = static_cast<std::size_t>(Counter::WorkLostToEnd) + 1;
 
 // What a count means for the health of the service.
 enum class Meaning : std::uint8_t {

@@ -24,6 +24,8 @@ public:
     // event with its builder, and loses an event with a number that is not finite in its payload.
     virtual void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
     virtual void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
+    // Logs the losses of events that the log does not show yet. Never waits for the disk.
+    virtual void reportLosses() = 0;
 };
 
 } // namespace platform

@@ -101,10 +101,10 @@ public:
     virtual ~ConnectionListener() = default;
     // The delegate must outlive the listener's run. Call this before `resume`.
     virtual void setDelegate(ConnectionListenerDelegate& delegate) = 0;
-    // Accepts connections, on the calling thread; returns after `stop`. It invalidates the connections before it
-    // returns.
+    // Accepts connections, on the calling thread; returns after `stop`. Before it returns, it ends the connections as
+    // if their peers had closed them: it delivers the calls that these have sent, and invalidates the connections.
     virtual void resume() = 0;
-    // Makes `resume` return; only tests call it. Any thread.
+    // Makes `resume` return, also if it is called later. Any thread.
     virtual void stop() = 0;
 };
 

@@ -1,16 +1,20 @@
-// kestod: puts the service object on the Linux platform and gives the main thread to the listener, for the life of the
-// process. It has no command line; the launch configuration is in the environment.
+// kestod: puts the service object on the Linux platform and gives the main thread to the listener, until a signal ends
+// the process. It has no command line; the launch configuration is in the environment.
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/LinuxPlatform.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/process/EndSignals.h"
 #include "platform/linux/process/ServiceManager.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "tracing/TraceRunner.h"
+#include "utility/EndProcess.h"
 #include "utility/LogCategories.h"
 
 #include <csignal>
 #include <cstdio>
+#include <memory>
 #include <string>
+#include <string_view>
 
 namespace {
 
@@ -33,14 +37,28 @@ std::expected<platform::ListeningSocket, std::string> takeSocket(platform::Launc
 
 // Clients rely on the service by now. An exception does not mean a wrong configuration any more: it ends the process,
 // as on every other thread, and the service manager starts the service again.
-int serve(platform::ConnectionListener& listener) noexcept
+//
+// At the end nothing is destroyed but the listener. Threads of traces run as long as the process and use the platform,
+// and an end that is cut short cannot destroy it either: so there is one way out, and nothing that only the other way
+// would do. The socket's file goes last: a next service that finds it gives way, instead of finding the store in use.
+[[noreturn]] void serve(platform::LinuxPlatform& platform,
+                        std::unique_ptr<platform::LinuxConnectionListener> listener) noexcept
 {
-    listener.resume();
-    return 0;
+    listener->resume();
+    platform.finish();
+    listener.reset();
+    utility::endProcess(platform::EndSignals::exitStatus);
+}
+
+void logEnd(const std::string& request)
+{
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "the service ends: {}", request);
+    platform::notifyStopping("ending: " + request);
 }
 
 int run()
 {
+    platform::EndSignals endSignals; // first, because every thread must block them
     auto launch = platform::LaunchConfiguration::fromEnvironment();
     if (!launch)
         return cannotRun(launch.error());
@@ -58,7 +76,14 @@ int run()
     const auto service = KestoReportingServiceDelegate::make();
     (*listener)->setDelegate(*service);
     (*listener)->setListeningHandler([] { platform::notifyReady("accepting connections"); });
-    return serve(**listener);
+    (*listener)->setStoppedHandler([&endSignals] { logEnd(*endSignals.request()); });
+    endSignals.setHandlers({.begin = [&target = **listener] { target.stop(); },
+                            .giveUp =
+                                [&platform](std::string_view reason) {
+                                    platform.giveUp(reason);
+                                    utility::reportLosses();
+                                }});
+    serve(platform, *std::move(listener));
 }
 
 } // namespace

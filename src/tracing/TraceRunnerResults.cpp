@@ -2,10 +2,10 @@
 #define KESTO_LOG_NAME "TraceRunner"
 #include "platform/Platform.h"
 #include "tracing/TraceRunner.h"
+#include "utility/EndProcess.h"
 #include "utility/LogCategories.h"
 
 #include <algorithm>
-#include <cstdlib>
 
 std::filesystem::path KestoReportingTracingLogsDirectory()
 {
@@ -26,7 +26,7 @@ void TraceRunner::writeQuilldat()
     perfWriter_ = platform::current().performanceWriter.open(directory / resultsFileName, projectName, resultsVersion_);
     if (!perfWriter_) {
         KESTO_LOG(KestoReportingTraceCategory(), Info, "Failed to open quilldat writer");
-        std::_Exit(exitStatus); // immediately, because other threads are running; acknowledged events are kept already
+        utility::endProcess(exitStatus);
     }
     for (const auto& traceWithResults : traceResults_) {
         printTraceResults(traceWithResults);

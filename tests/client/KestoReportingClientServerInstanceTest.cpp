@@ -824,15 +824,34 @@ protected:
     void killAloud()
     {
         platform.log.setObserver([](const LogLine& line) {
-            std::cerr << platform::name(line.level) << ' ' << line.tag << ' ' << line.message;
+            std::cerr << platform::name(line.level) << ' ' << line.tag << ' ' << line.message << '\n';
         });
+        platform.analytics.setReportingObserver([] { std::cerr << "losses of events\n"; });
+        platform.ledger.count(ledger::Counter::LostToDiskFull, 3);
+        platform.ledger.count(ledger::Counter::SessionsRefused, 2);
+        platform.ledger.count(ledger::Counter::ConnectionsRefused, 5); // by a limit: not lost
         player.submit(KillService, {});
     }
 };
 
 TEST_F(ClientDeathTest, EndsTheProcessOnTheCallersThreadWithStatusTwo)
 {
-    EXPECT_EXIT(killAloud(), testing::ExitedWithCode(2), "^default kerc DESTROYING SERVICE$");
+    EXPECT_EXIT(killAloud(), testing::ExitedWithCode(2),
+                "^default kerc player asks the service to end: connection of process 1001\n"
+                "default kerc DESTROYING SERVICE\n"
+                "losses of events\n"
+                "error kers lost since the start: lost.diskFull 3, sessions.refused 2\n$");
+}
+
+TEST_F(ClientDeathTest, NamesTheClientsProcessWhereNoConnectionIsAtWork)
+{
+    platform.processTable.remove(1001);
+    const auto killWithoutAConnection = [this] {
+        platform.log.setObserver([](const LogLine& line) { std::cerr << line.message << '\n'; });
+        player.object()->killService(nullptr);
+    };
+    EXPECT_EXIT(killWithoutAConnection(), testing::ExitedWithCode(2),
+                "^\\(null\\) asks the service to end: process 1001\nDESTROYING SERVICE\n$");
 }
 
 TEST_F(ClientDeathTest, EndsTheProcessAtOnceWithoutWhatIsLeftForItsExit)

@@ -271,7 +271,10 @@ TEST_F(CallToStoreTest, KillServiceEndsTheProcessWithStatus2)
     client.call(KillService);
     EXPECT_TRUE(client.isClosed());
     EXPECT_EQ(kestod.exitStatus(), 2);
-    EXPECT_THAT(kestod.log(), HasSubstr("DESTROYING SERVICE"));
+    EXPECT_THAT(kestod.log(),
+                MatchesRegex("(.|\n)* end_to_end_test asks the service to end: connection of process "
+                             + std::to_string(::getpid()) + " .user " + std::to_string(::getuid())
+                             + ".\n[^\n]*DESTROYING SERVICE\n"));
 }
 
 TEST_F(CallToStoreTest, AServiceThatWasKilledStartsAgainAtItsStaleSocket)

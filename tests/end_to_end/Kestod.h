@@ -5,6 +5,7 @@
 #include "support/TemporaryDirectory.h"
 
 #include <chrono>
+#include <csignal>
 #include <expected>
 #include <filesystem>
 #include <map>
@@ -67,7 +68,9 @@ public:
     // The same, for clients that do not wait: returns when the service listens.
     void startAndAwait();
     void kill();
-    // Waits for the process to end without a signal from the test.
+    // Sends the signal, which the process may handle.
+    void signal(int number) const { ::kill(process_, number); }
+    // Waits for the process to end. The status, or the negative number of the signal that killed it.
     [[nodiscard]] int exitStatus();
 
     // For a process that was started.

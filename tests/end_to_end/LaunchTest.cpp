@@ -1,14 +1,12 @@
 // Starting: the source of the socket, the error without one, and the notification of readiness.
 #include "end_to_end/Kestod.h"
+#include "end_to_end/ServiceManager.h"
 #include "end_to_end/WireClient.h"
 
-#include <cerrno>
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <sys/socket.h>
-#include <sys/un.h>
-#include <system_error>
 #include <unistd.h>
 
 namespace end_to_end {
@@ -18,17 +16,6 @@ using testing::HasSubstr;
 using testing::Not;
 
 constexpr int cannotRun = 78;
-
-platform::FileDescriptor socketBoundTo(const std::string& path, int type)
-{
-    platform::FileDescriptor socket(::socket(AF_UNIX, type | SOCK_CLOEXEC, 0));
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path.copy(address.sun_path, sizeof address.sun_path - 1);
-    if (!socket || ::bind(socket.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0)
-        throw std::system_error(errno, std::generic_category(), path);
-    return socket;
-}
 
 struct BadLaunch {
     std::string name;
@@ -76,19 +63,10 @@ TEST(LaunchTest, ASecondServiceAtTheSameSocketGivesWay)
 
 TEST(LaunchTest, TellsTheServiceManagerWhenItIsReady)
 {
-    const support::TemporaryDirectory directory;
-    const std::string path = directory.path() / "notify";
-    const platform::FileDescriptor manager = socketBoundTo(path, SOCK_DGRAM);
-    const timeval timeout{.tv_sec = patience.count(), .tv_usec = 0};
-    ::setsockopt(manager.get(), SOL_SOCKET, SO_RCVTIMEO, &timeout, sizeof timeout);
-
-    Kestod kestod({}, {{"NOTIFY_SOCKET", path}});
+    Notifications manager;
+    Kestod kestod({}, {{"NOTIFY_SOCKET", manager.path}});
     kestod.start();
-    std::string told(4096, '\0');
-    const ssize_t count = ::recv(manager.get(), told.data(), told.size(), 0);
-    ASSERT_GT(count, 0);
-    told.resize(static_cast<std::size_t>(count));
-    EXPECT_THAT(told, HasSubstr("READY=1"));
+    EXPECT_THAT(manager.next(), HasSubstr("READY=1"));
     WireClient(kestod.socketPath()).ask(GetAllReporters);
 }
 

@@ -36,6 +36,8 @@ TEST(CounterTable, ChargesOnlyMessagesAndEvents)
 {
     EXPECT_EQ(chargeOf(Counter::RefusedForMemory), Charge::Refused);
     EXPECT_EQ(chargeOf(Counter::LostToDiskFull), Charge::Lost);
+    EXPECT_EQ(chargeOf(Counter::LostToEnd), Charge::Lost);
+    EXPECT_EQ(chargeOf(Counter::CallsLostToEnd), std::nullopt);
     EXPECT_EQ(chargeOf(Counter::RemovedForShare), Charge::Removed);
     EXPECT_EQ(chargeOf(Counter::Recorded), std::nullopt);
     EXPECT_EQ(chargeOf(Counter::SessionsRefused), std::nullopt);

@@ -233,9 +233,10 @@ TEST_F(RunnerResultsDeathTest, EndTheProcessAtOnceWithoutWhatIsLeftForItsExit)
     platform.performanceWriter.canOpen = false;
     const auto traceWithAnExitHandler = [this] {
         std::atexit([] { std::_Exit(7); });
+        platform.analytics.setReportingObserver([] { std::cerr << "losses"; });
         trace({5});
     };
-    EXPECT_EXIT(traceWithAnExitHandler(), testing::ExitedWithCode(1), "") << "other threads run then";
+    EXPECT_EXIT(traceWithAnExitHandler(), testing::ExitedWithCode(1), "losses") << "other threads run then";
 }
 
 TEST_F(RunnerResultsDeathTest, EndTheProcessWithStatusOneAfterSayingThatTheDirectoryCannotBeMade)

@@ -49,6 +49,23 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
     workQueues_.setTurnEndHandler([this](Turn& turn) { analytics_.endTurn(turn, turn.letters.take()); });
 }
 
+void LinuxPlatform::finish()
+{
+    workQueues_.finish();
+    analytics_.flush();
+}
+
+void LinuxPlatform::giveUp(std::string_view reason)
+{
+    const auto [calls, work] = workQueues_.unfinished();
+    ledger_.count(ledger::Counter::CallsLostToEnd, calls);
+    ledger_.count(ledger::Counter::WorkLostToEnd, work);
+    const std::size_t events = analytics_.giveUp();
+    ProviderLog(log_).error("the end was cut short: {}: given up: {} calls and ends of connections, {} items of "
+                            "background work, {} events that were not stored yet",
+                            reason, calls, work, events);
+}
+
 Platform LinuxPlatform::platform()
 {
     return {.log = log_,

@@ -45,6 +45,13 @@ public:
     // The listener gives its descriptors to clients.
     [[nodiscard]] EmitterAccess& emitterAccess() noexcept { return emitterAccess_; }
 
+    // For the end, when the connections have ended. Returns when all submitted work is done and all events are kept or
+    // counted as lost. Not for items of a queue.
+    void finish();
+    // For an end that waits no longer: counts and logs what is not finished, with the reason. Never waits for the disk.
+    // Any thread.
+    void giveUp(std::string_view reason);
+
 private:
     LinuxLog log_;
     ConfigurationWatcher configurationWatcher_;

@@ -46,6 +46,8 @@ public:
     virtual ~ContractPeer() = default;
     // Makes the calls, all together, and does not wait until they are taken.
     virtual void call(const std::vector<Array>& frames) = 0;
+    // Returns when the calls have left the peer.
+    virtual void awaitSent() { }
     virtual void close() = 0;
     // Closes the connection in the middle of a call.
     virtual void breakOff() = 0;
@@ -137,6 +139,7 @@ public:
             }
         });
     }
+    void awaitSent() override { join(); }
     void close() override
     {
         join();
@@ -591,6 +594,22 @@ TEST_P(ConnectionContract, EndsWithoutInterruptionWhenItsListenerStops)
     }
     EXPECT_EQ(peer->nextAnswer(), std::nullopt);
     EXPECT_EQ(other->nextAnswer(), std::nullopt);
+}
+
+TEST_P(ConnectionContract, DeliversAllCallsThatWereMadeBeforeItsListenerStopped)
+{
+    constexpr int count = 40'000; // more than may be unanswered
+    std::vector<Array> calls;
+    for (int number = 1; number <= count; ++number)
+        calls.push_back(callOf(number));
+    const auto [peer, record] = listenAndConnect();
+    peer->call(calls);
+    peer->awaitSent();
+    subject->stop();
+    EXPECT_THAT(record->calls, SizeIs(count));
+    EXPECT_EQ(record->history.back(), "invalidated");
+    EXPECT_EQ(peer->nextAnswer(), std::nullopt);
+    record->calls.clear();
 }
 
 TEST_P(ConnectionContract, IsClosedWhenTheDelegateRefusesIt)

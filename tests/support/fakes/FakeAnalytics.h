@@ -53,6 +53,9 @@ public:
                                 PayloadBuilder payloadBuilder) override;
     void sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view eventName,
                                 PayloadBuilder payloadBuilder) override;
+    void reportLosses() override { whenReporting_(); }
+    // From now on a request to report losses calls this.
+    void setReportingObserver(std::function<void()> observer) { whenReporting_ = std::move(observer); }
 
 private:
     struct Sent {
@@ -65,6 +68,7 @@ private:
 
     ledger::Ledger& ledger_;
     std::function<void(const std::string&)> observer_;
+    std::function<void()> whenReporting_ = [] { };
     mutable foundation::Mutex lock_;
     std::vector<std::string> used_ KESTO_GUARDED_BY(lock_);
     std::vector<std::string> asked_ KESTO_GUARDED_BY(lock_);

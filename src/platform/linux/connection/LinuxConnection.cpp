@@ -134,9 +134,19 @@ void LinuxConnection::read()
         breakOff(std::string(systemErrorText(errno)));
 }
 
+// Behind the bytes that are left in the socket, the connection now finds its end.
+void LinuxConnection::finish()
+{
+    assert(hub_->isConnectionThread());
+    isFinishing_ = true;
+    ::shutdown(socket_.get(), SHUT_RD);
+    while (settle())
+        read();
+}
+
 void LinuxConnection::endOfStream()
 {
-    if (!input_.isInsideFrame()) {
+    if (!input_.isInsideFrame() || isFinishing_) {
         peerIsDone_ = true;
         return;
     }

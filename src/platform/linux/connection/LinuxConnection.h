@@ -62,6 +62,9 @@ public:
     // Ends the connection, with its handlers. Connection thread.
     void invalidate() { end(std::nullopt); }
 
+    // The same as if the peer closed it now: first delivers the calls that it has sent. Connection thread.
+    void finish();
+
 private:
     class Credit;
 
@@ -92,6 +95,7 @@ private:
     EndHandler invalidationHandler_;
     ConnectionInput input_;
     bool peerIsDone_ = false; // it closed its side between two frames
+    bool isFinishing_ = false; // by the service: a frame that is cut short is not the peer's fault
     bool hasAskedForEmitterAccess_ = false;
 
     // How far the client is behind.

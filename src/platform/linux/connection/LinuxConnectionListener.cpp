@@ -76,8 +76,10 @@ void LinuxConnectionListener::resume()
     if (listeningHandler_)
         listeningHandler_();
     serve();
+    if (stoppedHandler_)
+        stoppedHandler_();
     for (const auto& [identity, connection] : std::exchange(connections_, {}))
-        connection->invalidate();
+        connection->finish();
 }
 
 // When this thread has read everything, it helps with the calls of the clients, if they are few.

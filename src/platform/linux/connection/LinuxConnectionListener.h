@@ -49,8 +49,10 @@ public:
     void setEmitterAccess(EmitterAccess& access) { hub_->emitterAccess = &access; }
     // `resume` calls the handler once, as soon as new clients are served. Call this before `resume`.
     void setListeningHandler(std::move_only_function<void()> handler) { listeningHandler_ = std::move(handler); }
+    // `resume` calls the handler once, when it has been stopped, before it ends the connections. The same.
+    void setStoppedHandler(std::move_only_function<void()> handler) { stoppedHandler_ = std::move(handler); }
     void resume() override;
-    // Makes `resume` end all connections and return. Any thread.
+    // From now on new clients wait in the socket, until this object is destroyed.
     void stop() override;
 
 private:
@@ -84,6 +86,7 @@ private:
     const std::size_t mostConnectionsOfAUser_;
     ConnectionListenerDelegate* delegate_ = nullptr;
     std::move_only_function<void()> listeningHandler_;
+    std::move_only_function<void()> stoppedHandler_;
     std::atomic<bool> isStopping_ = false;
 
     // Only for the connection thread.

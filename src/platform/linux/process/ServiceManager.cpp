@@ -10,4 +10,9 @@ void notifyReady(const std::string& status)
     ::sd_notifyf(0, "READY=1\nSTATUS=%s", status.c_str());
 }
 
+void notifyStopping(const std::string& status)
+{
+    ::sd_notifyf(0, "STOPPING=1\nSTATUS=%s", status.c_str());
+}
+
 } // namespace platform

@@ -8,5 +8,7 @@ namespace platform {
 // Reports that the service now takes connections, with one line about its status for people. Does nothing without a
 // service manager. Any thread.
 void notifyReady(const std::string& status);
+// Reports that the service ends. The same.
+void notifyStopping(const std::string& status);
 
 } // namespace platform

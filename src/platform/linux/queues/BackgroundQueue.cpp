@@ -32,6 +32,7 @@ void BackgroundQueue::submit(WorkItem item)
 {
     const foundation::Lock lock(lock_);
     waiting_.push_back(std::move(item));
+    ++unfinished_;
     const bool isThreadWanted = freeThreads_ < waiting_.size() && threads_.size() < mostThreads && !isEnding_;
     if (!isThreadWanted || !addThread())
         changed_.notifyOne();
@@ -52,11 +53,34 @@ bool BackgroundQueue::isCurrent() const
     return queueOfThisThread == this;
 }
 
+void BackgroundQueue::finish()
+{
+    const foundation::Lock lock(lock_);
+    while (unfinished_ != 0)
+        finished_.wait(lock_);
+}
+
+std::size_t BackgroundQueue::unfinishedItems() const
+{
+    const foundation::Lock lock(lock_);
+    return unfinished_;
+}
+
 void BackgroundQueue::run()
 {
     queueOfThisThread = this;
-    while (WorkItem item = take())
+    while (WorkItem item = take()) {
         item();
+        item = nullptr;
+        countFinished();
+    }
+}
+
+void BackgroundQueue::countFinished()
+{
+    const foundation::Lock lock(lock_);
+    if (--unfinished_ == 0)
+        finished_.notifyAll();
 }
 
 // The next item, or an empty one at the end.

@@ -29,14 +29,22 @@ public:
     void submit(WorkItem item) override;
     [[nodiscard]] bool isCurrent() const override;
 
+    // Returns when no item waits or runs. Not for the queue's items.
+    void finish();
+    // The number of items that wait or run.
+    [[nodiscard]] std::size_t unfinishedItems() const;
+
 private:
     [[nodiscard]] bool addThread() KESTO_REQUIRES(lock_);
     void run();
     [[nodiscard]] WorkItem take();
+    void countFinished();
 
-    foundation::Mutex lock_;
+    mutable foundation::Mutex lock_;
     foundation::Condition changed_;
+    foundation::Condition finished_; // no item waits or runs
     std::deque<WorkItem> waiting_ KESTO_GUARDED_BY(lock_);
+    std::size_t unfinished_ KESTO_GUARDED_BY(lock_) = 0; // items that wait or run
     std::size_t freeThreads_ KESTO_GUARDED_BY(lock_) = 0;
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
     std::vector<std::thread> threads_ KESTO_GUARDED_BY(lock_);

@@ -1,8 +1,6 @@
 // Only the turns of turn queues have an end handler: items of other queues get no turn in which to gather.
 #include "platform/linux/queues/LinuxWorkQueues.h"
 
-#include "foundation/Mutex.h"
-
 #include <algorithm>
 #include <utility>
 
@@ -44,7 +42,36 @@ std::shared_ptr<WorkQueue> LinuxWorkQueues::makeSerialQueue(std::string_view nam
 
 std::shared_ptr<TurnQueue> LinuxWorkQueues::makeTurnQueue(std::string_view name, SerialQueueOptions options)
 {
-    return std::make_shared<SerialQueue>(name, options, turnEndHandler_);
+    auto queue = std::make_shared<SerialQueue>(name, options, turnEndHandler_);
+    const foundation::Lock lock(lock_);
+    std::erase_if(turnQueues_, [](const auto& known) { return known.expired(); });
+    turnQueues_.push_back(queue);
+    return queue;
+}
+
+std::vector<std::shared_ptr<SerialQueue>> LinuxWorkQueues::livingTurnQueues() const
+{
+    std::vector<std::shared_ptr<SerialQueue>> living;
+    const foundation::Lock lock(lock_);
+    for (const auto& known : turnQueues_)
+        if (auto queue = known.lock())
+            living.push_back(std::move(queue));
+    return living;
+}
+
+LinuxWorkQueues::Unfinished LinuxWorkQueues::unfinished() const
+{
+    Unfinished unfinished{.ofBackgroundQueue = backgroundQueue_.unfinishedItems()};
+    for (const auto& queue : livingTurnQueues())
+        unfinished.ofTurnQueues += queue->unfinishedItems();
+    return unfinished;
+}
+
+void LinuxWorkQueues::finish()
+{
+    for (const auto& queue : livingTurnQueues())
+        queue->finish();
+    backgroundQueue_.finish();
 }
 
 void LinuxWorkQueues::submitAfter(std::chrono::nanoseconds delay, WorkQueue& queue, WorkItem item)

@@ -4,9 +4,13 @@
 // The work queues of the process have threads of their own.
 #pragma once
 
+#include "foundation/Mutex.h"
 #include "platform/linux/queues/BackgroundQueue.h"
 #include "platform/linux/queues/DelayedWork.h"
 #include "platform/linux/queues/SerialQueue.h"
+
+#include <memory>
+#include <vector>
 
 namespace platform {
 
@@ -24,8 +28,21 @@ public:
     void submitAfter(std::chrono::nanoseconds delay, WorkQueue& queue, WorkItem item) override;
     [[nodiscard]] std::unique_ptr<Semaphore> makeSemaphore(unsigned initialCount) override;
 
+    // Submitted items that have not run, or whose turn is not over; delayed items do not count.
+    struct Unfinished {
+        std::size_t ofTurnQueues = 0;
+        std::size_t ofBackgroundQueue = 0;
+    };
+    [[nodiscard]] Unfinished unfinished() const;
+    // Returns when the turn queues have run everything, and then the background queue. Not for items and helpers.
+    void finish();
+
 private:
+    [[nodiscard]] std::vector<std::shared_ptr<SerialQueue>> livingTurnQueues() const;
+
     SerialQueue::TurnEndHandler turnEndHandler_;
+    mutable foundation::Mutex lock_;
+    std::vector<std::weak_ptr<SerialQueue>> turnQueues_ KESTO_GUARDED_BY(lock_);
     BackgroundQueue backgroundQueue_;
     DelayedWork delayedWork_; // ends first, because it submits to the other
 };

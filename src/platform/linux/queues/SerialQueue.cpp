@@ -70,6 +70,19 @@ public:
 
     [[nodiscard]] bool isCurrent() const noexcept { return thisThread.runs == this; }
 
+    void finish()
+    {
+        const foundation::Lock lock(lock_);
+        while (isTurnTaken_ || !waiting_.empty())
+            finished_.wait(lock_);
+    }
+
+    [[nodiscard]] std::size_t unfinishedItems()
+    {
+        const foundation::Lock lock(lock_);
+        return waiting_.size() + itemsOfTurn_;
+    }
+
     // The calling thread's part in serial queues.
     struct ThisThread {
         const Work* runs = nullptr;
@@ -114,6 +127,7 @@ private:
     {
         isTurnTaken_ = true;
         items_.swap(waiting_);
+        itemsOfTurn_ = items_.size();
     }
 
     void runTurn()
@@ -136,17 +150,22 @@ private:
     {
         const foundation::Lock lock(lock_);
         isTurnTaken_ = false;
+        itemsOfTurn_ = 0;
         if (isEnding_ || !waiting_.empty())
             wakeThread();
+        if (waiting_.empty())
+            finished_.notifyAll();
     }
 
     const TurnEndHandler turnEndHandler_;
     const bool mayBeHelped_;
     foundation::Mutex lock_;
     foundation::Condition changed_;
+    foundation::Condition finished_; // nothing waits or runs
     std::vector<TurnItem> waiting_ KESTO_GUARDED_BY(lock_);
     std::vector<TurnItem> items_; // `items_` and `turn_` belong to the thread that has taken the turn
     Turn turn_;
+    std::size_t itemsOfTurn_ KESTO_GUARDED_BY(lock_) = 0;
     bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // a thread is running one
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread sleeps, and has not been woken yet
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
@@ -182,6 +201,17 @@ void SerialQueue::submit(TurnItem item)
 bool SerialQueue::isCurrent() const
 {
     return work_->isCurrent();
+}
+
+void SerialQueue::finish()
+{
+    assert(!isCurrent());
+    work_->finish();
+}
+
+std::size_t SerialQueue::unfinishedItems() const
+{
+    return work_->unfinishedItems();
 }
 
 SerialQueue::Helper::Helper()

@@ -42,6 +42,11 @@ public:
     void submit(TurnItem item) override;
     [[nodiscard]] bool isCurrent() const override;
 
+    // Returns when no item waits and no turn runs. Not for the queue's items and helpers.
+    void finish();
+    // The number of items that wait, or whose turn is not over.
+    [[nodiscard]] std::size_t unfinishedItems() const;
+
     // The calling thread helps as long as this object lives. Its priority is that of an interactive queue: with a lower
     // one, a client that wakes for an answer would displace the thread that is not yet done with it. One for each
     // thread.

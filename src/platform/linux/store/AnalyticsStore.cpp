@@ -122,6 +122,23 @@ void AnalyticsStore::flush()
     kept.get_future().wait();
 }
 
+// The counts of what is being written are with the store's thread: these events are counted here as if they had just
+// come. Should they be committed all the same, the next start finds them in the store.
+std::size_t AnalyticsStore::giveUp()
+{
+    ledger::Tally tally;
+    std::size_t events = 0;
+    {
+        const foundation::Lock lock(lock_);
+        tally.takeFrom(waiting_.tally);
+        tally.add(Counter::Events, eventsInWriting_);
+        events = waiting_.events.size() + eventsInWriting_;
+    }
+    tally.add(Counter::LostToEnd, events);
+    ledger_.post(tally);
+    return events;
+}
+
 // --- Between callers and the store's thread
 
 // Reads the current values, so that of several calls the last applies the last values.
@@ -167,6 +184,7 @@ void AnalyticsStore::run()
             keeper_->open();
         const bool isQuiet = batch.empty();
         keeper_->keep(batch.events, batch.tally);
+        eventsAreKept();
         post(batch.tally); // before the answers leave: what is acknowledged is counted
         for (WhenKept& whenKept : batch.whenKept)
             whenKept();
@@ -228,6 +246,7 @@ bool AnalyticsStore::take(Batch& batch)
         std::swap(configuration, newConfiguration_);
         std::swap(batch, waiting_);
         isWriting_ = !batch.empty();
+        eventsInWriting_ = batch.events.size();
         room_.notifyAll();
     }
     if (configuration)
@@ -246,6 +265,12 @@ bool AnalyticsStore::sleep()
         isQuiet = changed_.waitUntil(lock_, std::chrono::steady_clock::now() + quietTime) == std::cv_status::timeout;
     isAsleep_ = false;
     return !isQuiet;
+}
+
+void AnalyticsStore::eventsAreKept()
+{
+    const foundation::Lock lock(lock_);
+    eventsInWriting_ = 0;
 }
 
 void AnalyticsStore::finish()

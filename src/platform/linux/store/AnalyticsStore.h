@@ -72,6 +72,10 @@ public:
 
     // Returns when everything taken so far is committed or counted as lost.
     void flush();
+    // For a process that ends now: counts the events taken that are neither as lost, and returns their number. Never
+    // waits for the disk.
+    std::size_t giveUp();
+    void reportLosses() override { keeper_->reportLosses(); }
 
 private:
     // Events, their counts, and the callbacks that wait for them.
@@ -97,6 +101,7 @@ private:
     void post(ledger::Tally& tally);
     void settle(ledger::Tally& tally, std::uint64_t stored);
     [[nodiscard]] bool sleep() KESTO_REQUIRES(lock_);
+    void eventsAreKept();
     void finish();
     [[nodiscard]] bool isIdle();
 
@@ -105,7 +110,8 @@ private:
     const ProviderLog log_;
     const Limits limits_;
     UsedEventNames names_;
-    const std::unique_ptr<EventKeeper> keeper_; // only for the store's thread, as the next
+    const std::unique_ptr<EventKeeper> keeper_; // for the store's thread, except what any thread may call
+    // Only for the store's thread.
     std::optional<ledger::StoreState> lastState_;
     std::uint64_t storedByLedger_; // the events that are in the store according to the ledger
 
@@ -114,6 +120,7 @@ private:
     foundation::Condition room_; // the waiting batch was taken
     Batch waiting_ KESTO_GUARDED_BY(lock_);
     std::optional<AnalyticsConfiguration> newConfiguration_ KESTO_GUARDED_BY(lock_);
+    std::size_t eventsInWriting_ KESTO_GUARDED_BY(lock_) = 0;
     bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until the callbacks of the batch have returned
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // so that only a caller that finds it asleep pays for waking it
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;

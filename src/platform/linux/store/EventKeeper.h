@@ -14,9 +14,9 @@
 
 namespace platform {
 
-// The store's thread calls its functions. The keeper is made on the thread that makes the store, before the first call,
-// and destroyed on the thread that destroys the store, after the last. It logs its own failures, and counts in the
-// tally that it gets: events kept, lost and removed.
+// The store's thread calls its functions, unless said otherwise. The keeper is made on the thread that makes the store,
+// before the first call, and destroyed on the thread that destroys the store, after the last. It logs its own failures,
+// and counts in the tally that it gets: events kept, lost and removed.
 class EventKeeper {
 public:
     EventKeeper() = default;
@@ -40,6 +40,8 @@ public:
     virtual bool tidy(bool isQuiet, ledger::Tally& tally) = 0;
     // What the place holds now; nothing while it is not open.
     [[nodiscard]] virtual std::optional<ledger::StoreState> state() const = 0;
+    // Logs the lost events that the log does not show yet. Never waits for the disk. Any thread.
+    virtual void reportLosses() = 0;
 };
 
 } // namespace platform

@@ -1,29 +1,31 @@
-// The destructor reports the losses that are not reported yet, so that none is forgotten when the service ends.
+// The end of the service reports the losses that are not reported yet, so that none is forgotten.
 #include "platform/linux/store/EventLosses.h"
 
 namespace platform {
 
-EventLosses::~EventLosses()
-{
-    for (std::size_t reason = 0; reason < storeErrorCount; ++reason)
-        if (losses_[reason].reported < losses_[reason].events)
-            log(static_cast<StoreError>(reason), losses_[reason]);
-}
-
 void EventLosses::add(StoreError reason, std::uint64_t events)
 {
+    const foundation::Lock lock(lock_);
     losses_[static_cast<std::size_t>(reason)].events += events;
 }
 
 void EventLosses::report()
 {
     const double now = clock_.systemUptime();
-    for (std::size_t reason = 0; reason < storeErrorCount; ++reason) {
-        Loss& loss = losses_[reason];
-        const bool isDue = loss.reported == 0 || now - loss.reportedAt >= secondsBetweenLines;
-        if (loss.reported < loss.events && isDue)
+    reportIf([now](const Loss& loss) { return loss.reported == 0 || now - loss.reportedAt >= secondsBetweenLines; });
+}
+
+void EventLosses::reportAll()
+{
+    reportIf([](const Loss&) { return true; });
+}
+
+template <typename IsDue> void EventLosses::reportIf(IsDue isDue)
+{
+    const foundation::Lock lock(lock_);
+    for (std::size_t reason = 0; reason < storeErrorCount; ++reason)
+        if (Loss& loss = losses_[reason]; loss.reported < loss.events && isDue(loss))
             log(static_cast<StoreError>(reason), loss);
-    }
 }
 
 void EventLosses::log(StoreError reason, Loss& loss)

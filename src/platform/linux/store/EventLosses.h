@@ -2,6 +2,7 @@
 // minute while losses go on, so that a full disk does not also fill the log.
 #pragma once
 
+#include "foundation/Mutex.h"
 #include "platform/Clock.h"
 #include "platform/linux/log/ProviderLog.h"
 #include "platform/linux/store/StoreError.h"
@@ -12,7 +13,7 @@
 
 namespace platform {
 
-// One thread.
+// Any thread.
 class EventLosses {
 public:
     static constexpr double secondsBetweenLines = 60;
@@ -25,13 +26,15 @@ public:
     {
     }
     // Reports the remaining losses.
-    ~EventLosses();
+    ~EventLosses() { reportAll(); }
     EventLosses(const EventLosses&) = delete;
     EventLosses& operator=(const EventLosses&) = delete;
 
     void add(StoreError reason, std::uint64_t events);
     // Reports new losses, except for reasons that were reported within the last minute.
     void report();
+    // Reports all new losses, because no later report will come.
+    void reportAll();
 
 private:
     struct Loss {
@@ -40,12 +43,14 @@ private:
         double reportedAt = 0; // the time of the last report (uptime, in seconds)
     };
 
-    void log(StoreError reason, Loss& loss);
+    template <typename IsDue> void reportIf(IsDue isDue);
+    void log(StoreError reason, Loss& loss) KESTO_REQUIRES(lock_);
 
     const std::filesystem::path path_;
     const Clock& clock_;
     const ProviderLog log_;
-    std::array<Loss, storeErrorCount> losses_;
+    foundation::Mutex lock_;
+    std::array<Loss, storeErrorCount> losses_ KESTO_GUARDED_BY(lock_);
 };
 
 } // namespace platform

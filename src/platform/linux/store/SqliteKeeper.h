@@ -47,6 +47,7 @@ public:
     [[nodiscard]] bool awaitsQuiet() const override;
     bool tidy(bool isQuiet, ledger::Tally& tally) override;
     [[nodiscard]] std::optional<ledger::StoreState> state() const override;
+    void reportLosses() override { losses_.reportAll(); }
 
 private:
     template <typename Result = void> using Expected = SqliteEventFile::Expected<Result>;

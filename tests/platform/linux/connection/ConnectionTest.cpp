@@ -86,6 +86,67 @@ TEST_F(Connections, CallAllHandlersOnOneThread)
     EXPECT_EQ(threads.size(), 1U);
 }
 
+TEST_F(Connections, AreNotInterruptedWhenTheListenerStopsInsideAFrame)
+{
+    listen();
+    SocketClient client(path);
+    client.write(callNumber(1) + "\x01");
+    ConnectionRecord& record = connected();
+    ASSERT_TRUE(waitForCalls(record, 1));
+    stop();
+    EXPECT_THAT(record.history, ElementsAre("call 1", "invalidated"));
+    EXPECT_THAT(logged(), IsEmpty());
+}
+
+TEST_F(Connections, BreakByTheirLastCallWhenTheListenerStops)
+{
+    std::latch isBusy(1);
+    std::latch goesOn(1);
+    handler = [&](ConnectionRecord& record, Connection::Call& call) -> std::expected<void, Connection::Violation> {
+        if (call.frame[0] == Value(2))
+            return std::unexpected(Connection::Violation{"method 99 is unknown"});
+        progress.change([&] { record.history.emplace_back("call 1"); });
+        isBusy.count_down();
+        goesOn.wait();
+        return {};
+    };
+    listen();
+    SocketClient client(path);
+    client.write(callNumber(1));
+    ConnectionRecord& record = connected();
+    isBusy.wait();
+    client.write(callNumber(2));
+    listener->stop();
+    goesOn.count_down();
+    stop();
+    EXPECT_THAT(record.history, ElementsAre("call 1", "interrupted", "invalidated"));
+    EXPECT_THAT(logged(), ElementsAre(endsBecause("method 99 is unknown")));
+}
+
+TEST_F(Connections, EndAfterTheStoppedHandler)
+{
+    beforeListening = [this] {
+        listener->setStoppedHandler([this] { EXPECT_THAT(records.at(0)->history, IsEmpty()); });
+    };
+    listen();
+    const SocketClient client(path);
+    ConnectionRecord& record = connected();
+    stop();
+    EXPECT_THAT(record.history, ElementsAre("invalidated"));
+}
+
+TEST_F(Connections, AreNotAcceptedByAListenerThatWasStoppedBeforeItBegan)
+{
+    beforeListening = [this] { listener->stop(); };
+    listen();
+    SocketClient client(path); // waits in the socket
+    stop();
+    EXPECT_THAT(records, IsEmpty());
+    listener.reset();
+    EXPECT_EQ(client.readNumber(), std::nullopt);
+    EXPECT_FALSE(std::filesystem::exists(path));
+}
+
 TEST_F(Connections, MayOutliveTheirListener)
 {
     listen();

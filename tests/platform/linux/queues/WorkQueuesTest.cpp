@@ -12,6 +12,7 @@
 #include <algorithm>
 #include <array>
 #include <atomic>
+#include <future>
 #include <gtest/gtest.h>
 #include <latch>
 #include <pthread.h>
@@ -565,6 +566,75 @@ TEST_F(WorkQueuesTest, BackgroundItemsThatNoThreadCameForRunBeforeTheQueueGoes)
         });
     }
     EXPECT_EQ(ran, 2);
+}
+
+TEST_F(TurnsTest, AQueueIsFinishedWhenTheEndOfItsLastTurnHasReturned)
+{
+    std::promise<void> begun;
+    std::promise<void> goesOn;
+    queue->submit([&] {
+        queue->submit([&] { history.push_back(2); });
+        begun.set_value();
+        goesOn.get_future().wait();
+        history.push_back(1);
+    });
+    begun.get_future().wait();
+    EXPECT_EQ(queues.unfinished().ofTurnQueues, 2U) << "the one that runs, and the one that waits";
+    goesOn.set_value();
+    queues.finish();
+    EXPECT_EQ(history, (std::vector{1, 0, 2, 0}));
+    EXPECT_EQ(queues.unfinished().ofTurnQueues, 0U);
+}
+
+TEST_F(TurnsTest, AnItemIsUnfinishedUntilItsTurnIsOver)
+{
+    std::promise<void> begun;
+    std::promise<void> goesOn;
+    queue->submit([&] { // these three are one turn
+        queue->submit([] { });
+        queue->submit([] { });
+        queue->submit([&] {
+            begun.set_value();
+            goesOn.get_future().wait();
+        });
+    });
+    begun.get_future().wait();
+    EXPECT_EQ(queues.unfinished().ofTurnQueues, 3U);
+    goesOn.set_value();
+    queues.finish();
+}
+
+TEST_F(WorkQueuesTest, TheQueuesFinishWhenBackgroundItemsThatTurnsSubmittedHaveRun)
+{
+    std::atomic<int> ran = 0;
+    const auto queue = queues.makeTurnQueue("com.quarn.kesto.test", {});
+    queue->submit([&] {
+        queues.backgroundQueue().submit([&] {
+            queues.backgroundQueue().submit([&] { ++ran; });
+            ++ran;
+        });
+    });
+    queues.finish();
+    EXPECT_EQ(ran, 2);
+    EXPECT_EQ(queues.unfinished().ofBackgroundQueue, 0U);
+}
+
+TEST_F(WorkQueuesTest, BackgroundItemsAreUnfinishedWhileTheyWaitAndRun)
+{
+    constexpr std::size_t waiting = 3;
+    std::latch begun(BackgroundQueue::mostThreads);
+    std::latch goesOn(1);
+    for (std::size_t item = 0; item < BackgroundQueue::mostThreads + waiting; ++item)
+        queues.backgroundQueue().submit([&, item] {
+            if (item < BackgroundQueue::mostThreads)
+                begun.count_down();
+            goesOn.wait();
+        });
+    begun.wait();
+    EXPECT_EQ(queues.unfinished().ofBackgroundQueue, BackgroundQueue::mostThreads + waiting);
+    goesOn.count_down();
+    queues.finish();
+    EXPECT_EQ(queues.unfinished().ofBackgroundQueue, 0U);
 }
 
 TEST_F(WorkQueuesTest, DelayedItemsFromManyThreadsAllRun)

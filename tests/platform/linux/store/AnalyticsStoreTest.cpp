@@ -176,6 +176,58 @@ TEST_F(AnalyticsStoreTest, AnEventOutsideATurnIsKeptWithoutAnybodyAsking)
     EXPECT_EQ(storedEvents(), 1);
 }
 
+TEST_F(AnalyticsStoreTest, CountsTheEventsThatItGivesUp)
+{
+    class SlowKeeper final : public support::MemoryKeeper {
+    public:
+        using MemoryKeeper::MemoryKeeper;
+        void keep(EventBatch& events, ledger::Tally& tally) override
+        {
+            if (events.size() != 0 && !std::exchange(wasSlow_, true)) {
+                isKeeping.set_value();
+                goesOn.get_future().wait();
+            }
+            MemoryKeeper::keep(events, tally);
+        }
+        std::promise<void> isKeeping;
+        std::promise<void> goesOn;
+
+    private:
+        bool wasSlow_ = false;
+    };
+    auto slow = std::make_unique<SlowKeeper>(std::make_shared<support::KeptEvents>(), clock);
+    SlowKeeper& keeper = *slow;
+    AnalyticsStore tested(std::move(slow), watcher, clock, ledger, ProviderLog(log), limits);
+    const auto sendOne = [&] { tested.sendAnalyticsEventLazy(outsideTurn, eventName, [] { return Dictionary(); }); };
+    EXPECT_EQ(tested.giveUp(), 0U);
+    sendOne();
+    keeper.isKeeping.get_future().wait();
+    sendOne();
+    sendOne();
+    EXPECT_EQ(tested.giveUp(), 3U) << "one is being kept, and two wait";
+    EXPECT_EQ(ledger.account()[Counter::Events], 3U);
+    EXPECT_EQ(ledger.account()[Counter::LostToEnd], 3U);
+    keeper.goesOn.set_value();
+    tested.flush();
+    EXPECT_EQ(tested.giveUp(), 0U);
+}
+
+TEST_F(AnalyticsStoreTest, ReportsItsLossesWithoutItsThread)
+{
+    store().flush();
+    fs::remove_all(temporary.path());
+    send(1);
+    store().flush();
+    ASSERT_THAT(log.take(), testing::Not(IsEmpty())) << "the first loss is reported at once";
+    send(2);
+    store().flush();
+    EXPECT_THAT(log.take(), IsEmpty());
+    const Hold hold(store()); // which sends another
+    store().reportLosses();
+    EXPECT_THAT(log.take(),
+                ElementsAre(Field(&support::LogLine::message, HasSubstr("2 analytics events were lost (3 since"))));
+}
+
 // --- Turns
 
 TEST_F(AnalyticsStoreTest, ATurnIsKeptBeforeItIsAcknowledged)

@@ -50,6 +50,18 @@ TEST_P(EventLossesTest, AreToldAtTheEndAtTheLatest)
     EXPECT_THAT(log.take(), tells("1 analytics events were lost (1 since the start): /state/analytics.sqlite3: "));
 }
 
+TEST_P(EventLossesTest, AreAllToldToACallerWhoWaitsNoLonger)
+{
+    losses->add(GetParam().first, 7);
+    losses->report();
+    log.take();
+    losses->add(GetParam().first, 2);
+    losses->reportAll();
+    EXPECT_THAT(log.take(), tells("2 analytics events were lost (9 since the start): /state/analytics.sqlite3: "));
+    losses.reset();
+    EXPECT_THAT(log.take(), IsEmpty()) << "all losses were reported";
+}
+
 INSTANTIATE_TEST_SUITE_P(
     OfEachReason, EventLossesTest,
     testing::Values(

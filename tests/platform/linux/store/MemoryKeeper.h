@@ -78,6 +78,7 @@ public:
         });
         return false;
     }
+    void reportLosses() override { }
     [[nodiscard]] std::optional<ledger::StoreState> state() const override
     {
         const auto events = place_->all();

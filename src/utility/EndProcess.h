@@ -1,0 +1,14 @@
+// What every end of the process has in common, whether it ends in order or in the middle of its work.
+#pragma once
+
+namespace utility {
+
+// Logs what was lost: the events whose loss the log does not show yet, and in one line all that was lost since the
+// start. Never waits for the disk. Any thread.
+void reportLosses();
+
+// Reports the losses, and ends the process with that status immediately, because other threads are running: nothing is
+// destroyed, and nothing waits for the disk. Acknowledged events are kept already. Any thread.
+[[noreturn]] void endProcess(int status);
+
+} // namespace utility
