@@ -132,8 +132,13 @@ private:
     };
     class Analytics final : public platform::Analytics {
         [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
-        void sendAnalyticsEventLazy(platform::Turn&, std::string_view, PayloadBuilder) override { }
-        void sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view, PayloadBuilder) override { }
+        void sendAnalyticsEventLazy(platform::Turn&, const platform::Origin&, std::string_view, PayloadBuilder) override
+        {
+        }
+        void sendAnalyticsEventLazy(platform::OutsideTurn, const platform::Origin&, std::string_view,
+                                    PayloadBuilder) override
+        {
+        }
         void reportLosses() override { }
     };
     class TraceEmitter final : public platform::TraceEmitter {

@@ -93,27 +93,43 @@ KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t repor
     return delegate ? delegate->findReportingSessionForID(reporterID) : nullptr;
 }
 
-void KestoReportingClientServerInstance::addSession(ledger::Tally& tally, std::int64_t reporterID, Session session)
+void KestoReportingClientServerInstance::announceSource(platform::Turn& turn) const
+{
+    utility::assertServerQueue();
+    const foundation::Lock lock(registrationLock_);
+    turn.events.announce({.number = source_,
+                          .userIdentifier = userIdentifier_,
+                          .processIdentifier = processIdentifier_,
+                          .processName = clientProcessName_.value_or(std::string()),
+                          .time = clientStartDate_.value_or(0)});
+}
+
+void KestoReportingClientServerInstance::addSession(platform::Turn& turn, std::int64_t reporterID, Session session)
 {
     utility::assertServerQueue();
     const std::size_t before = clientReportingSessionMap_.size();
+    if (const auto replaced = clientReportingSessionMap_.find(reporterID))
+        replaced->announceEnd(turn);
+    session->setOwner(source_);
     clientReportingSessionMap_.set(reporterID, std::move(session));
     const std::size_t added = clientReportingSessionMap_.size() - before;
     sessionsOfTheService += added;
-    tally.add(Counter::SessionsCreated);
-    tally.add(Counter::SessionsGone, 1 - added); // the one that it replaces
+    turn.tally.add(Counter::SessionsCreated);
+    turn.tally.add(Counter::SessionsGone, 1 - added); // the one that it replaces
     if (const auto delegate = delegate_.lock())
         delegate->reporterIDAdded(reporterID, *this);
 }
 
-void KestoReportingClientServerInstance::removeSession(ledger::Tally& tally, std::int64_t reporterID)
+void KestoReportingClientServerInstance::removeSession(platform::Turn& turn, std::int64_t reporterID)
 {
     utility::assertServerQueue();
     const std::size_t before = clientReportingSessionMap_.size();
+    if (const auto session = clientReportingSessionMap_.find(reporterID))
+        session->announceEnd(turn);
     clientReportingSessionMap_.remove(reporterID);
     const std::size_t removed = before - clientReportingSessionMap_.size();
     sessionsOfTheService -= removed;
-    tally.add(Counter::SessionsGone, removed);
+    turn.tally.add(Counter::SessionsGone, removed);
     if (const auto delegate = delegate_.lock())
         delegate->reporterIDRemoved(reporterID, *this);
 }
@@ -127,7 +143,7 @@ void KestoReportingClientServerInstance::createReportingSession(std::int64_t rep
         const bool isRoom =
             self.clientReportingSessionMap_.size() < mostSessions && sessionsOfTheService < mostSessionsOfTheService;
         if (replaces || isRoom) {
-            self.addSession(turn.tally, reporterID,
+            self.addSession(turn, reporterID,
                             std::make_shared<KestoReportingSession>(reporterID, std::vector{self.processIdentifier_},
                                                                     self.budget_, self.culprit()));
             KESTO_LOG(KestoReportingClientCategory(), Default, "session created for reporter {}", reporterID);
@@ -258,7 +274,7 @@ void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t re
         if (const auto session = self.clientReportingSessionMap_.find(reporterID)) {
             if (session->started())
                 session->stop(turn);
-            self.removeSession(turn.tally, reporterID);
+            self.removeSession(turn, reporterID);
         }
         KESTO_LOG(KestoReportingClientCategory(), Default, "destroying {}", reporterID);
         reply(turn, std::nullopt, true);
@@ -317,8 +333,8 @@ void KestoReportingClientServerInstance::handleConnectionError()
             if (session->started())
                 session->stop(turn);
         }
-        std::ranges::for_each(reporterIDs,
-                              [&](std::int64_t reporterID) { self.removeSession(turn.tally, reporterID); });
+        std::ranges::for_each(reporterIDs, [&](std::int64_t reporterID) { self.removeSession(turn, reporterID); });
+        turn.events.announceSourceEnd({self.source_, platform::current().clock.secondsSince1970()});
         delegate->removeClient(self.shared_from_this());
         KESTO_LOG(KestoReportingClientCategory(), Default, "removing {} from the server client list",
                   self.processIdentifier_);

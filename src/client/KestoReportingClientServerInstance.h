@@ -41,6 +41,10 @@ public:
 
     // Any thread.
     [[nodiscard]] std::int32_t processIdentifier() const { return processIdentifier_; }
+    // The number of its connection, which its events carry. Any thread.
+    [[nodiscard]] std::uint64_t source() const { return source_; }
+    // Announces who is behind that number.
+    void announceSource(platform::Turn& turn) const;
     // When the client was registered (seconds since 1970), and the name that it had then. Any thread.
     [[nodiscard]] std::optional<double> clientStartDate() const;
     void setClientStartDate(std::optional<double> date);
@@ -78,6 +82,7 @@ private:
         std::int32_t sender;
         std::uint32_t user;
         std::string processName;
+        std::uint64_t source; // the connection that it came over
     };
     using Session = std::shared_ptr<KestoReportingSession>;
 
@@ -104,11 +109,12 @@ private:
     static void deliverToSession(platform::Turn& turn, const Message& message, const Session& session);
     [[nodiscard]] ledger::Culprit culprit() const;
     static void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
-    void addSession(ledger::Tally& tally, std::int64_t reporterID, Session session);
-    void removeSession(ledger::Tally& tally, std::int64_t reporterID);
+    void addSession(platform::Turn& turn, std::int64_t reporterID, Session session);
+    void removeSession(platform::Turn& turn, std::int64_t reporterID);
 
     const std::int32_t processIdentifier_;
     const std::uint32_t userIdentifier_;
+    const std::uint64_t source_ = platform::nextOriginNumber();
     std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);
     std::optional<std::string> clientProcessName_ KESTO_GUARDED_BY(registrationLock_);
     client::SessionMap clientReportingSessionMap_;

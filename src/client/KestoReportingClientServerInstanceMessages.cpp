@@ -25,23 +25,23 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
     const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
     const std::uint32_t user = caller != nullptr ? caller->userIdentifier() : userIdentifier_;
     auto processName = KestoReportingUtilityProcessNameForPID(sender);
-    submit(
-        [message = Message{std::move(message), category, type, sender, user, std::move(processName).value_or("(null)")},
-         reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
-            KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
-                      reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
-            utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
-            const auto delegate = self.delegate_.lock();
-            if (!delegate)
-                return reply(turn, std::nullopt);
-            if (!delegate->isReportingEnabled())
-                return reply(turn, utility::reportingDisabled);
-            if (reporterIDs)
-                self.deliverToReporters(turn, *delegate, message, *reporterIDs);
-            else
-                self.deliverToActiveSessions(turn, *delegate, message);
-            reply(turn, std::nullopt);
-        });
+    submit([message = Message{std::move(message), category, type, sender, user,
+                              std::move(processName).value_or("(null)"), source_},
+            reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
+        KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
+                  reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
+        utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
+        const auto delegate = self.delegate_.lock();
+        if (!delegate)
+            return reply(turn, std::nullopt);
+        if (!delegate->isReportingEnabled())
+            return reply(turn, utility::reportingDisabled);
+        if (reporterIDs)
+            self.deliverToReporters(turn, *delegate, message, *reporterIDs);
+        else
+            self.deliverToActiveSessions(turn, *delegate, message);
+        reply(turn, std::nullopt);
+    });
 }
 
 void KestoReportingClientServerInstance::deliverToReporters(platform::Turn& turn,
@@ -124,8 +124,8 @@ void KestoReportingClientServerInstance::deliverToSinks(platform::Turn& turn,
                                                         KestoReportingServiceDelegateProtocol& delegate,
                                                         const Message& message, const Session& session)
 {
-    const auto& [payload, category, type, sender, user, processName] = message;
-    KestoReportingFennicBridge::handleEvent(turn, payload, category, type, session);
+    const auto& [payload, category, type, sender, user, processName, source] = message;
+    KestoReportingFennicBridge::handleEvent(turn, payload, category, type, session, source);
     KestoReportingGimboUtility::handleEvent(payload, category, type, session);
     KestoReportingTrelmBridge::handleEvent(payload, category, type, session);
     const platform::BugCapture::SenderScope scope(sender);

@@ -22,8 +22,12 @@ public:
     // soon as possible. The events of one turn keep their order, and so do the events that one thread sends outside
     // turns. The service calls the builder at most once, on any thread, when it needs the payload. It drops an unwanted
     // event with its builder, and loses an event with a number that is not finite in its payload.
-    virtual void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
-    virtual void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) = 0;
+    //
+    // The origin is one that a turn's batch announced (see EventBatch), or none.
+    virtual void sendAnalyticsEventLazy(Turn& turn, const Origin& origin, std::string_view eventName,
+                                        PayloadBuilder payloadBuilder) = 0;
+    virtual void sendAnalyticsEventLazy(OutsideTurn, const Origin& origin, std::string_view eventName,
+                                        PayloadBuilder payloadBuilder) = 0;
     // Logs the losses of events that the log does not show yet. Never waits for the disk.
     virtual void reportLosses() = 0;
 };

@@ -1,4 +1,7 @@
-// Events on their way to the keeper, written in the form in which it stores them.
+// Events on their way to the keeper, written in the form in which it stores them, and who sent them.
+//
+// The two events of a message, one for all services and one for its own, differ only in their names: they are one row
+// with two names, so that the store keeps the payload once.
 //
 // The thread that built a payload writes its JSON at once: done on another thread, its shared strings would move
 // between two processors. Only a large payload waits for the thread that keeps the events, because clients wait for the
@@ -6,21 +9,32 @@
 #pragma once
 
 #include "foundation/values/Value.h"
+#include "platform/Origin.h"
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <span>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <vector>
 
 namespace platform {
 
-// One event in its stored form.
+// The key under which a message says when it happened, in seconds since 1970 UTC.
+inline constexpr std::string_view timestampKey = "kestoreporting_timestamp";
+
+// One message in its stored form: an event, or two with the same payload.
 struct EventRow {
-    double time = 0; // seconds since 1970 UTC
+    double time = 0; // when the service sent it; seconds since 1970 UTC, as below
+    std::optional<double> happened; // where the payload says it
+    Origin origin;
     std::string_view name;
+    std::string_view secondName; // empty: one event
     std::string_view payload; // JSON
+
+    [[nodiscard]] std::uint64_t events() const noexcept { return secondName.empty() ? 1 : 2; }
 };
 
 // One thread at a time.
@@ -29,27 +43,44 @@ public:
     // In bytes of memory, roughly: a payload that takes more waits.
     static constexpr std::size_t largestWrittenAtOnce = 64 * 1024;
 
-    // The time is in seconds since 1970 UTC.
-    void add(double time, std::string_view name, const foundation::Dictionary& payload);
+    // The time is in seconds since 1970 UTC. An event with the payload object and the origin of the one before it, but
+    // another name, is the second event of the same message, and has its time. A name is not empty.
+    void add(double time, const Origin& origin, std::string_view name, const foundation::Dictionary& payload);
+    void add(double time, std::string_view name, const foundation::Dictionary& payload)
+    {
+        add(time, {}, name, payload);
+    }
+    // Says who is behind an origin, before its first event or again when it changed; says that it ends.
+    void announce(SourceBegin begin);
+    void announce(SessionBegin begin);
+    void announceSourceEnd(OriginEnd end) { announcements_.sourceEnds.push_back(end); }
+    void announceSessionEnd(OriginEnd end) { announcements_.sessionEnds.push_back(end); }
+
     // Puts the events of the other behind these; it is then empty.
     void takeFrom(EventBatch& other);
     void clear();
 
-    // How many events were added, and how many bytes they take, roughly.
-    [[nodiscard]] std::size_t size() const noexcept { return events_.size(); }
+    // How many events were added, and how many bytes all of this takes, roughly.
+    [[nodiscard]] std::size_t size() const noexcept { return events_; }
+    [[nodiscard]] bool empty() const noexcept { return events_ == 0 && announcements_.empty(); }
     [[nodiscard]] std::size_t bytes() const noexcept;
 
-    // The events in their order, without those with a payload that JSON cannot express. Valid until the batch changes.
+    // The messages in their order, without those with a payload that JSON cannot express. Valid until the batch
+    // changes.
     [[nodiscard]] std::span<const EventRow> rows();
+    [[nodiscard]] const OriginAnnouncements& announcements() const noexcept { return announcements_; }
 
 private:
     struct Text { // in `texts_`
         std::size_t begin = 0;
         std::size_t size = 0;
     };
-    struct Event {
+    struct Message {
         double time;
+        std::optional<double> happened;
+        Origin origin;
         Text name;
+        Text secondName;
         std::size_t payload; // its place in `payloads_`
     };
     struct Payload {
@@ -57,15 +88,20 @@ private:
         foundation::Dictionary waiting; // becomes JSON in `rows`
     };
 
+    [[nodiscard]] bool isSecondEventOfLast(const Origin& origin, std::string_view name) const;
+    void addPayload(const foundation::Dictionary& payload);
+    [[nodiscard]] Text append(std::string_view text);
     [[nodiscard]] Text write(const foundation::Dictionary& payload);
     [[nodiscard]] std::string_view view(const Text& text) const;
 
-    std::vector<Event> events_;
+    std::size_t events_ = 0;
+    std::vector<Message> messages_;
     std::vector<Payload> payloads_;
     foundation::Dictionary lastPayload_; // both events of a message share one
     std::string texts_;
     std::size_t waitingBytes_ = 0;
     std::vector<EventRow> rows_;
+    OriginAnnouncements announcements_;
 };
 
 } // namespace platform

@@ -66,7 +66,8 @@ void KestoReportingServiceDelegate::handleEventForVorp(const foundation::Diction
         vorpStateManager_->handleEvent(message, category, type, session, processName);
 }
 
-void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)
+void KestoReportingServiceDelegate::registerClient(platform::Turn& turn,
+                                                   const std::shared_ptr<KestoReportingClientServerInstance>& client)
 {
     utility::assertServerQueue();
     clients_.push_back(client);
@@ -77,6 +78,7 @@ void KestoReportingServiceDelegate::registerClient(const std::shared_ptr<KestoRe
     client->setClientStartDate(platform::current().clock.secondsSince1970());
     platform::current().processTable.forget(client->processIdentifier()); // an earlier process may have had the number
     client->setClientProcessName(KestoReportingUtilityProcessNameForPID(client->processIdentifier()));
+    client->announceSource(turn);
 }
 
 void KestoReportingServiceDelegate::removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)

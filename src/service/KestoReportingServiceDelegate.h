@@ -77,7 +77,7 @@ private:
     [[nodiscard]] static std::optional<foundation::Value> valueOf(const Feature& feature);
     [[nodiscard]] static std::string descriptionOf(const Features& features);
     [[nodiscard]] foundation::Value stateForBugCapture() const;
-    void registerClient(const std::shared_ptr<KestoReportingClientServerInstance>& client);
+    void registerClient(platform::Turn& turn, const std::shared_ptr<KestoReportingClientServerInstance>& client);
     static void handleInvalidation(std::int32_t processIdentifier,
                                    const std::shared_ptr<KestoReportingClientServerInstance>& client);
 

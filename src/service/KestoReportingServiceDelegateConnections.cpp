@@ -25,9 +25,9 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
             [adapter = client::ServiceProtocolAdapter(client, platform::current().ledger)](
                 platform::Connection::Call call) mutable { return adapter.handleCall(std::move(call)); });
     }
-    utility::serverQueue()->submit([self = shared_from_this(), weakClient] {
+    utility::serverQueue()->submit([self = shared_from_this(), weakClient](platform::Turn& turn) {
         if (const auto client = weakClient.lock())
-            self->registerClient(client);
+            self->registerClient(turn, client);
     });
     connection->setInterruptionHandler([weakClient] {
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "interruptionHandler: connection exited");
@@ -71,6 +71,6 @@ void KestoReportingServiceDelegate::handleInvalidation(
         return;
     }
     platform::current().analytics.sendAnalyticsEventLazy(
-        platform::outsideTurn, "com.quarn.kesto.kestoreportingclientuptime",
+        platform::outsideTurn, {.source = client->source(), .session = 0}, "com.quarn.kesto.kestoreportingclientuptime",
         [name = *processName, uptime] { return foundation::Dictionary{{"processName", name}, {"seconds", uptime}}; });
 }

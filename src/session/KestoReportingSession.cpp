@@ -84,6 +84,7 @@ void KestoReportingSession::setServiceType(AudioServiceType type)
 {
     serviceType_ = type;
     serviceName_ = KestoReportingUtilityGenerateServiceNameFromServiceType(type);
+    isAnnounced_ = false;
     KESTO_LOG(KestoReportingSessionCategory(), Info, "setting service type {}", serviceName_);
 }
 
@@ -121,6 +122,38 @@ void KestoReportingSession::updateConfigurationWithContentsOfConfiguration(
     configuration_ = std::move(merged);
     if (configuration->contains(utility::hostApplicationKey))
         applicationText_ = applicationText(configuration_);
+    isAnnounced_ = isAnnounced_ && !configuration->contains(utility::hostApplicationKey);
+}
+
+void KestoReportingSession::setOwner(std::uint64_t source)
+{
+    utility::assertServerQueue();
+    origin_ = {.source = source, .session = platform::nextOriginNumber()};
+    created_ = platform::current().clock.secondsSince1970();
+}
+
+// With the first event, and again after a change: a client cannot cause more announcements than events.
+platform::Origin KestoReportingSession::announcedOrigin(platform::Turn& turn)
+{
+    utility::assertServerQueue();
+    if (origin_.session == 0 || std::exchange(isAnnounced_, true))
+        return origin_;
+    wasAnnounced_ = true;
+    const foundation::Lock lock(configurationLock_);
+    turn.events.announce({.number = origin_.session,
+                          .source = origin_.source,
+                          .reporterID = reporterID_,
+                          .serviceType = std::string(serviceName_),
+                          .application = applicationText_,
+                          .time = created_});
+    return origin_;
+}
+
+void KestoReportingSession::announceEnd(platform::Turn& turn)
+{
+    utility::assertServerQueue();
+    if (std::exchange(wasAnnounced_, false))
+        turn.events.announceSessionEnd({origin_.session, platform::current().clock.secondsSince1970()});
 }
 
 void KestoReportingSession::setDriverSnapShot(std::optional<session::DriverSnapShot> snapShot)

@@ -49,6 +49,12 @@ public:
     // One line for the log.
     [[nodiscard]] std::string description() const;
 
+    // Makes it a session that the store knows: its events carry its number and that of its owner's connection.
+    void setOwner(std::uint64_t source);
+    [[nodiscard]] platform::Origin announcedOrigin(platform::Turn& turn) override;
+    // Announces that it gets no more messages, if the store knows it.
+    void announceEnd(platform::Turn& turn);
+
     void setServiceType(AudioServiceType type);
     [[nodiscard]] AudioServiceType serviceType() const override { return serviceType_; }
     // The service type's name; empty until a service type is set.
@@ -181,6 +187,10 @@ private:
     std::shared_ptr<session::MessageStore>
         nestedAggregatedPayloadData_ KESTO_GUARDED_BY(nestedAggregatedPayloadDataLock_);
     std::string_view serviceName_;
+    platform::Origin origin_;
+    double created_ = 0; // seconds since 1970
+    bool isAnnounced_ = false; // as it is now
+    bool wasAnnounced_ = false;
     std::optional<std::string> tracingFileName_;
     std::unique_ptr<TraceParams> traceParams_;
     std::unique_ptr<TraceRunner> traceRunner_;

@@ -72,19 +72,23 @@ const EventNames& eventNames(AudioEventCategory category, AudioEventType type, A
 
 void KestoReportingFennicBridge::handleEvent(platform::Turn& turn, const foundation::Dictionary& message,
                                              AudioEventCategory category, AudioEventType type,
-                                             const std::shared_ptr<const sinks::SinkSession>& session)
+                                             const std::shared_ptr<sinks::SinkSession>& session, std::uint64_t source)
 {
     utility::assertServerQueue();
     platform::Analytics& analytics = platform::current().analytics;
     std::shared_ptr<LazyPayload> payload;
+    platform::Origin origin;
     const auto offer = [&](const std::string& eventName) {
         if (!analytics.isAnalyticsEventUsed(eventName)) {
             turn.tally.add(ledger::Counter::Events);
             return turn.tally.add(ledger::Counter::Unwanted);
         }
-        if (!payload)
+        if (!payload) {
             payload = std::make_shared<LazyPayload>(message, session);
-        analytics.sendAnalyticsEventLazy(turn, eventName, [payload] { return payload->build(); });
+            origin = session->announcedOrigin(turn);
+            origin.source = source != 0 ? source : origin.source;
+        }
+        analytics.sendAnalyticsEventLazy(turn, origin, eventName, [payload] { return payload->build(); });
     };
     const EventNames& names = eventNames(category, type, session->serviceType());
     offer(names.ofAllServices);

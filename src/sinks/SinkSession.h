@@ -2,6 +2,7 @@
 #pragma once
 
 #include "foundation/values/Value.h"
+#include "platform/Turn.h"
 #include "utility/MessageKinds.h"
 
 namespace sinks {
@@ -12,6 +13,9 @@ public:
     virtual ~SinkSession() = default;
     [[nodiscard]] virtual AudioServiceType serviceType() const = 0;
     [[nodiscard]] virtual foundation::Dictionary configuration() const = 0;
+    // The session's number and its owner's, for the origin of its events; the turn announces what the session is where
+    // the store does not know it yet. None: it is not among the sessions that the store knows. Server queue.
+    [[nodiscard]] virtual platform::Origin announcedOrigin(platform::Turn& turn) = 0;
 };
 
 } // namespace sinks

@@ -6,6 +6,7 @@
 
 #include "foundation/Mutex.h"
 #include "foundation/values/Value.h"
+#include "platform/EventBatch.h"
 #include "platform/ProcessTable.h"
 #include "utility/LogCategories.h"
 #include "utility/MessageKinds.h"
@@ -20,7 +21,7 @@
 namespace utility {
 
 // The payload key of the time that a client gives a message, in seconds since 1970.
-constexpr std::string_view timestampKey = "kestoreporting_timestamp";
+constexpr std::string_view timestampKey = platform::timestampKey;
 // The configuration and payload key of the application for which a client plays.
 constexpr std::string_view hostApplicationKey = "HostApplicationDisplayID";
 

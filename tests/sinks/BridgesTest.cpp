@@ -17,9 +17,15 @@ class GivenSession final : public sinks::SinkSession {
 public:
     [[nodiscard]] AudioServiceType serviceType() const override { return type; }
     [[nodiscard]] Dictionary configuration() const override { return settings; }
+    [[nodiscard]] platform::Origin announcedOrigin(platform::Turn& turn) override
+    {
+        turn.events.announce(platform::SessionBegin{.number = origin.session});
+        return origin;
+    }
 
     AudioServiceType type = 2;
     Dictionary settings;
+    platform::Origin origin;
 };
 
 class FennicBridgeTest : public testing::Test {

@@ -30,6 +30,7 @@ public:
     explicit SessionOfServiceType(AudioServiceType serviceType) : serviceType_(serviceType) { }
     [[nodiscard]] AudioServiceType serviceType() const override { return serviceType_; }
     [[nodiscard]] Dictionary configuration() const override { return {}; }
+    [[nodiscard]] platform::Origin announcedOrigin(platform::Turn&) override { return {}; }
 
 private:
     const AudioServiceType serviceType_;

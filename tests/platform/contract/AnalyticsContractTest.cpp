@@ -111,8 +111,8 @@ private:
     [[nodiscard]] std::vector<AnalyticsEvent> kept() override
     {
         support::StoreReader reader(directory_ / platform::SqliteKeeper::fileName);
-        const auto names = reader.texts("SELECT name FROM events ORDER BY rowid");
-        const auto payloads = reader.texts("SELECT payload FROM events ORDER BY rowid");
+        const auto names = reader.texts("SELECT name FROM events ORDER BY id");
+        const auto payloads = reader.texts("SELECT payload FROM events ORDER BY id");
         std::vector<AnalyticsEvent> events;
         for (std::size_t index = 0; index < names.size(); ++index)
             events.push_back(event(names[index], payloads.at(index)));
@@ -147,7 +147,7 @@ protected:
     }
     void send(const std::string& name, Dictionary payload)
     {
-        subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, name,
+        subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, {}, name,
                                                     [payload = std::move(payload)] { return payload; });
     }
 };
@@ -186,7 +186,7 @@ TEST_P(AnalyticsContract, KeepsTheEventsOfATurnInTheirOrderOnceItIsOver)
     want("com.quarn.a");
     platform::Turn turn;
     for (int number = 1; number <= 3; ++number)
-        subject->analytics().sendAnalyticsEventLazy(turn, "com.quarn.a",
+        subject->analytics().sendAnalyticsEventLazy(turn, {}, "com.quarn.a",
                                                     [number] { return Dictionary{{"n", number}}; });
     subject->end(turn);
     send("com.quarn.a", {{"n", 4}});
@@ -200,7 +200,7 @@ TEST_P(AnalyticsContract, CountsWhatBecameOfEachEventAndHandsTheCountsOfATurnToI
     want("com.quarn.a");
     platform::Turn turn;
     for (const char* name : {"com.quarn.a", "com.quarn.b", "com.quarn.a"})
-        subject->analytics().sendAnalyticsEventLazy(turn, name, [] { return Dictionary(); });
+        subject->analytics().sendAnalyticsEventLazy(turn, {}, name, [] { return Dictionary(); });
     EXPECT_EQ(subject->account()[ledger::Counter::Events], 0U);
     subject->end(turn);
     send("com.quarn.a", {});
@@ -217,10 +217,11 @@ TEST_P(AnalyticsContract, BuildsAPayloadOnceAndLetsItsBuilderGo)
     int built = 0;
     auto held = std::make_shared<int>(7);
     const std::weak_ptr<int> watched = held;
-    subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, "com.quarn.a", [&built, held = std::move(held)] {
-        ++built;
-        return Dictionary{{"n", *held}};
-    });
+    subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, {}, "com.quarn.a",
+                                                [&built, held = std::move(held)] {
+                                                    ++built;
+                                                    return Dictionary{{"n", *held}};
+                                                });
     EXPECT_LE(built, 1);
     EXPECT_EQ(subject->events().size(), 1U);
     EXPECT_EQ(subject->events().size(), 1U) << "even if it is read several times";
@@ -233,7 +234,7 @@ TEST_P(AnalyticsContract, DropsAnUnwantedEventWithItsBuilder)
     want("com.quarn.a");
     auto held = std::make_shared<int>(7);
     const std::weak_ptr<int> watched = held;
-    subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, "com.quarn.b", [held = std::move(held)] {
+    subject->analytics().sendAnalyticsEventLazy(platform::outsideTurn, {}, "com.quarn.b", [held = std::move(held)] {
         ADD_FAILURE() << "the service does not need the payload";
         return Dictionary{{"n", *held}};
     });

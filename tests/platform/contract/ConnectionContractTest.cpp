@@ -66,6 +66,7 @@ public:
     [[nodiscard]] virtual std::unique_ptr<ContractPeer> connect() = 0;
     // The process ID of the peers.
     [[nodiscard]] virtual std::int32_t peerProcess() const = 0;
+    [[nodiscard]] virtual std::uint32_t peerUser() const = 0;
     // A queue with the turn-end handler of the service.
     [[nodiscard]] virtual platform::TurnQueue& serverQueue() = 0;
     // Runs waiting items, if no thread does.
@@ -101,10 +102,11 @@ public:
     void stop() override { listener_.stop(); }
     [[nodiscard]] std::unique_ptr<ContractPeer> connect() override
     {
-        connections_.push_back(listener_.connect(peerProcess()));
+        connections_.push_back(listener_.connect(peerProcess(), peerUser()));
         return std::make_unique<FakePeer>(connections_.back());
     }
     [[nodiscard]] std::int32_t peerProcess() const override { return 1001; }
+    [[nodiscard]] std::uint32_t peerUser() const override { return 501; }
     [[nodiscard]] platform::TurnQueue& serverQueue() override { return *queue_; }
     void work() override
     {
@@ -197,6 +199,7 @@ public:
     }
     [[nodiscard]] std::unique_ptr<ContractPeer> connect() override { return std::make_unique<LinuxPeer>(path_); }
     [[nodiscard]] std::int32_t peerProcess() const override { return ::getpid(); }
+    [[nodiscard]] std::uint32_t peerUser() const override { return ::getuid(); }
     [[nodiscard]] platform::TurnQueue& serverQueue() override { return *queue_; }
 
 private:
@@ -335,11 +338,13 @@ TEST_P(ConnectionContract, TellsWhoIsAtTheOtherEndAlsoWhenItIsOver)
 {
     const auto [peer, record] = listenAndConnect();
     EXPECT_EQ(record->connection->processIdentifier(), subject->peerProcess());
+    EXPECT_EQ(record->connection->userIdentifier(), subject->peerUser());
     const std::string description = record->connection->description();
     EXPECT_THAT(description, testing::HasSubstr(std::to_string(subject->peerProcess())));
     peer->close();
     ASSERT_TRUE(waitForEnd(*record));
     EXPECT_EQ(record->connection->processIdentifier(), subject->peerProcess());
+    EXPECT_EQ(record->connection->userIdentifier(), subject->peerUser());
     EXPECT_EQ(record->connection->description(), description);
 }
 

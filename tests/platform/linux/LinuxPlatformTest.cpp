@@ -85,7 +85,7 @@ TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)
     const auto queue = platform.workQueues.makeTurnQueue("com.quarn.kesto.test", {});
     std::promise<void> sent;
     queue->submit([&](Turn& turn) {
-        platform.analytics.sendAnalyticsEventLazy(turn, "com.quarn.kesto.test",
+        platform.analytics.sendAnalyticsEventLazy(turn, {}, "com.quarn.kesto.test",
                                                   [] { return foundation::Dictionary(); });
         sent.set_value();
     });
@@ -115,7 +115,7 @@ TEST_F(LinuxPlatformTest, WhatWasSentIsKeptWhenThePlatformEnds)
 {
     {
         LinuxPlatform providers(launch());
-        providers.platform().analytics.sendAnalyticsEventLazy(outsideTurn, "com.quarn.kesto.test",
+        providers.platform().analytics.sendAnalyticsEventLazy(outsideTurn, {}, "com.quarn.kesto.test",
                                                               [] { return foundation::Dictionary(); });
     }
     EXPECT_EQ(support::StoreReader(directory.path() / "state" / "analytics.sqlite3").eventCount(), 1);

@@ -36,11 +36,20 @@ std::vector<std::string> FakeAnalytics::sent() const
     return names;
 }
 
+std::vector<platform::Origin> FakeAnalytics::origins() const
+{
+    const foundation::Lock lock(lock_);
+    std::vector<platform::Origin> origins;
+    for (const auto& event : sent_)
+        origins.push_back(event.origin);
+    return origins;
+}
+
 std::vector<AnalyticsEvent> FakeAnalytics::events()
 {
     const foundation::Lock lock(lock_);
     std::vector<AnalyticsEvent> events;
-    for (auto& [name, builder, payload] : sent_) {
+    for (auto& [name, origin, builder, payload] : sent_) {
         if (!payload) {
             payload = builder();
             builder = nullptr;
@@ -102,28 +111,29 @@ bool FakeAnalytics::isUsed(const std::string& name) const
 }
 
 // Events are stored immediately: only real stores delay the events of a turn, and their tests cover this.
-void FakeAnalytics::sendAnalyticsEventLazy(platform::Turn& turn, std::string_view eventName,
-                                           PayloadBuilder payloadBuilder)
+void FakeAnalytics::sendAnalyticsEventLazy(platform::Turn& turn, const platform::Origin& origin,
+                                           std::string_view eventName, PayloadBuilder payloadBuilder)
 {
-    send(turn.tally, std::string(eventName), std::move(payloadBuilder));
+    send(turn.tally, origin, std::string(eventName), std::move(payloadBuilder));
 }
 
-void FakeAnalytics::sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view eventName,
-                                           PayloadBuilder payloadBuilder)
+void FakeAnalytics::sendAnalyticsEventLazy(platform::OutsideTurn, const platform::Origin& origin,
+                                           std::string_view eventName, PayloadBuilder payloadBuilder)
 {
     ledger::Tally tally;
-    send(tally, std::string(eventName), std::move(payloadBuilder));
+    send(tally, origin, std::string(eventName), std::move(payloadBuilder));
     ledger_.post(tally);
 }
 
-void FakeAnalytics::send(ledger::Tally& tally, std::string name, PayloadBuilder payloadBuilder)
+void FakeAnalytics::send(ledger::Tally& tally, const platform::Origin& origin, std::string name,
+                         PayloadBuilder payloadBuilder)
 {
     const foundation::Lock lock(lock_);
     const bool isWanted = isUsed(name);
     tally.add(ledger::Counter::Events);
     tally.add(isWanted ? ledger::Counter::Kept : ledger::Counter::Unwanted);
     if (isWanted)
-        sent_.push_back({std::move(name), std::move(payloadBuilder), std::nullopt});
+        sent_.push_back({std::move(name), origin, std::move(payloadBuilder), std::nullopt});
 }
 
 } // namespace support

@@ -37,6 +37,8 @@ public:
     // The names that the service asked about, and those of the wanted events that it sent, in order. Builds nothing.
     [[nodiscard]] std::vector<std::string> asked() const;
     [[nodiscard]] std::vector<std::string> sent() const;
+    // Their origins.
+    [[nodiscard]] std::vector<platform::Origin> origins() const;
     // The sent events, in the second form only those of one name; builds missing payloads. Events with a payload that
     // JSON cannot express are lost.
     [[nodiscard]] std::vector<AnalyticsEvent> events();
@@ -49,9 +51,9 @@ public:
     void clear();
 
     bool isAnalyticsEventUsed(std::string_view eventName) override;
-    void sendAnalyticsEventLazy(platform::Turn& turn, std::string_view eventName,
+    void sendAnalyticsEventLazy(platform::Turn& turn, const platform::Origin& origin, std::string_view eventName,
                                 PayloadBuilder payloadBuilder) override;
-    void sendAnalyticsEventLazy(platform::OutsideTurn, std::string_view eventName,
+    void sendAnalyticsEventLazy(platform::OutsideTurn, const platform::Origin& origin, std::string_view eventName,
                                 PayloadBuilder payloadBuilder) override;
     void reportLosses() override { whenReporting_(); }
     // From now on a request to report losses calls this.
@@ -60,10 +62,11 @@ public:
 private:
     struct Sent {
         std::string name;
+        platform::Origin origin;
         PayloadBuilder builder;
         std::optional<foundation::Dictionary> payload;
     };
-    void send(ledger::Tally& tally, std::string name, PayloadBuilder payloadBuilder);
+    void send(ledger::Tally& tally, const platform::Origin& origin, std::string name, PayloadBuilder payloadBuilder);
     [[nodiscard]] bool isUsed(const std::string& name) const KESTO_REQUIRES(lock_);
 
     ledger::Ledger& ledger_;

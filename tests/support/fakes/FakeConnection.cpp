@@ -147,9 +147,10 @@ FakeConnectionListener::~FakeConnectionListener()
         connection->letGo();
 }
 
-std::shared_ptr<FakeConnection> FakeConnectionListener::connect(std::int32_t processIdentifier)
+std::shared_ptr<FakeConnection> FakeConnectionListener::connect(std::int32_t processIdentifier,
+                                                                std::uint32_t userIdentifier)
 {
-    auto connection = std::make_shared<FakeConnection>(processIdentifier);
+    auto connection = std::make_shared<FakeConnection>(processIdentifier, userIdentifier);
     connections_.push_back(connection);
     if (!delegate_->shouldAcceptNewConnection(*this, connection))
         connection->close();

@@ -95,7 +95,7 @@ public:
     FakeConnectionListener& operator=(const FakeConnectionListener&) = delete;
 
     // A process connects. The connection is over if the delegate refuses it.
-    std::shared_ptr<FakeConnection> connect(std::int32_t processIdentifier);
+    std::shared_ptr<FakeConnection> connect(std::int32_t processIdentifier, std::uint32_t userIdentifier = 0);
 
     void setDelegate(platform::ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
     // Returns immediately: the test makes connections.

@@ -56,13 +56,14 @@ AnalyticsStore::~AnalyticsStore()
     thread_.join();
 }
 
-void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder)
+void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, const Origin& origin, std::string_view eventName,
+                                            PayloadBuilder payloadBuilder)
 {
     turn.tally.add(Counter::Events);
     if (!isAnalyticsEventUsed(eventName)) // most callers have asked already, and then this costs little
         return turn.tally.add(Counter::Unwanted);
     const double time = clock_.secondsSince1970();
-    turn.events.add(time, eventName, payloadBuilder());
+    turn.events.add(time, origin, eventName, payloadBuilder());
     if (isRoomBeside(turn.events, 0))
         return;
     const foundation::Lock lock(lock_);
@@ -72,7 +73,8 @@ void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, std::string_view eventNa
     waitForRoom();
 }
 
-void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder)
+void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, const Origin& origin, std::string_view eventName,
+                                            PayloadBuilder payloadBuilder)
 {
     ledger::Tally tally;
     tally.add(Counter::Events);
@@ -83,7 +85,7 @@ void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, std::string_view eventN
     const double time = clock_.secondsSince1970();
     const foundation::Dictionary payload = payloadBuilder();
     const foundation::Lock lock(lock_);
-    waiting_.events.add(time, eventName, payload);
+    waiting_.events.add(time, origin, eventName, payload);
     waiting_.tally.takeFrom(tally);
     wakeKeeper();
     waitForRoom();
@@ -93,7 +95,7 @@ void AnalyticsStore::endTurn(Turn& turn, WhenKept whenKept)
 {
     {
         const foundation::Lock lock(lock_);
-        if (turn.events.size() != 0 || !isEverythingKept()) {
+        if (!turn.events.empty() || !isEverythingKept()) {
             waiting_.events.takeFrom(turn.events);
             waiting_.tally.takeFrom(turn.tally);
             if (whenKept)

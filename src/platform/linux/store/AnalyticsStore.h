@@ -61,8 +61,10 @@ public:
     // Both stamp the event with the time and build its payload before they return. They block only while too much waits
     // to be written. An event of a turn is written when the turn has ended or is too large, any other event as soon as
     // possible.
-    void sendAnalyticsEventLazy(Turn& turn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
-    void sendAnalyticsEventLazy(OutsideTurn, std::string_view eventName, PayloadBuilder payloadBuilder) override;
+    void sendAnalyticsEventLazy(Turn& turn, const Origin& origin, std::string_view eventName,
+                                PayloadBuilder payloadBuilder) override;
+    void sendAnalyticsEventLazy(OutsideTurn, const Origin& origin, std::string_view eventName,
+                                PayloadBuilder payloadBuilder) override;
 
     // Takes the events and the counts of a turn. Calls `whenKept`, unless it is empty, once everything taken so far is
     // committed or counted as lost: before it returns if that is so already, otherwise later on the store's thread. The
@@ -84,7 +86,7 @@ private:
         ledger::Tally tally;
         std::vector<WhenKept> whenKept;
 
-        [[nodiscard]] bool empty() const noexcept { return events.size() == 0 && tally.empty() && whenKept.empty(); }
+        [[nodiscard]] bool empty() const noexcept { return events.empty() && tally.empty() && whenKept.empty(); }
         void clear();
     };
 

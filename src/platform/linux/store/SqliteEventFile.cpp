@@ -1,85 +1,36 @@
-// The only file that uses SQLite's interface. It reduces SQLite's errors to the few kinds that an owner can act on.
+// What stands in memory and in the database, such as the next ID, changes with a transaction or is dropped with it.
 #include "platform/linux/store/SqliteEventFile.h"
 
-#include <cassert>
 #include <cerrno>
 #include <fcntl.h>
 #include <fmt/format.h>
-#include <sqlite3.h>
-#include <string>
 #include <sys/file.h>
 #include <sys/stat.h>
+#include <utility>
+#include <vector>
 
 namespace platform {
-namespace {
-
-// The size of the log file that stays when the log is empty again: a burst needs as much.
-constexpr std::uint64_t mostLogKept = 32 * 1024 * 1024;
-
-bool isForWantOfRoom(int systemError)
-{
-    return systemError == ENOSPC || systemError == EDQUOT || systemError == EFBIG;
-}
-
-// SQLite recognises a full disk, but not a quota or a limit of file sizes that is used up.
-StoreError errorOfDisk(sqlite3* connection)
-{
-    for (const int which : {SQLITE_FCNTL_FILE_POINTER, SQLITE_FCNTL_JOURNAL_POINTER}) {
-        sqlite3_file* file = nullptr;
-        int systemError = 0;
-        ::sqlite3_file_control(connection, "main", which, static_cast<void*>(&file));
-        if (file != nullptr && file->pMethods != nullptr)
-            file->pMethods->xFileControl(file, SQLITE_FCNTL_LAST_ERRNO, &systemError);
-        if (isForWantOfRoom(systemError))
-            return StoreError::DiskFull;
-    }
-    return isForWantOfRoom(::sqlite3_system_errno(connection)) ? StoreError::DiskFull : StoreError::InputOutput;
-}
-
-StoreError errorOf(sqlite3* connection)
-{
-    switch (::sqlite3_errcode(connection) & 0xFF) {
-    case SQLITE_FULL: return StoreError::DiskFull;
-    case SQLITE_READONLY: return StoreError::ReadOnly;
-    case SQLITE_BUSY:
-    case SQLITE_LOCKED: return StoreError::Locked;
-    case SQLITE_CANTOPEN:
-    case SQLITE_PERM:
-    case SQLITE_AUTH: return StoreError::CannotOpen;
-    case SQLITE_IOERR: return errorOfDisk(connection);
-    case SQLITE_CORRUPT:
-    case SQLITE_NOTADB: return StoreError::Corrupt;
-    default: return StoreError::Other;
-    }
-}
-
-int count(std::size_t length)
-{
-    return static_cast<int>(length);
-}
-
-} // namespace
-
-void SqliteEventFile::CloseConnection::operator()(sqlite3* connection) const noexcept
-{
-    ::sqlite3_close(connection);
-}
-
-void SqliteEventFile::FinalizeStatement::operator()(sqlite3_stmt* statement) const noexcept
-{
-    ::sqlite3_finalize(statement);
-}
 
 SqliteEventFile::~SqliteEventFile() = default;
 
+template <typename Work> SqliteEventFile::Expected<> SqliteEventFile::inTransaction(Work work)
+{
+    if (const auto done = begin(); !done)
+        return done;
+    if (const auto done = work(); !done)
+        return done;
+    return commit();
+}
+
 // --- Opening
 
-SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>> SqliteEventFile::open(const std::filesystem::path& path)
+SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>> SqliteEventFile::open(const std::filesystem::path& path,
+                                                                                  KnownOrigins& origins)
 {
-    std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path));
+    std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path, origins));
     for (const auto step :
-         {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::checkOrMakeSchema,
-          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::countEvents})
+         {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::makeSchema,
+          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::recogniseOrigins})
         if (const auto done = (*database.*step)(); !done)
             return std::unexpected(done.error());
     return database;
@@ -98,15 +49,10 @@ SqliteEventFile::Expected<> SqliteEventFile::lockDirectory()
 
 SqliteEventFile::Expected<> SqliteEventFile::connect()
 {
-    sqlite3* connection = nullptr;
-    const int opened = ::sqlite3_open_v2(path_.c_str(), &connection,
-                                         SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
-    connection_.reset(connection);
-    if (opened != SQLITE_OK)
-        return std::unexpected(lastError());
-    if (::sqlite3_db_readonly(connection, "main") == 1)
-        return std::unexpected(StoreError::ReadOnly);
-    ::sqlite3_busy_timeout(connection, count(longestWaitForLock.count()));
+    auto connection = SqliteConnection::open(path_);
+    if (!connection)
+        return std::unexpected(connection.error());
+    connection_ = std::move(*connection);
 
     struct stat status = {};
     if (::stat(path_.c_str(), &status) != 0)
@@ -116,93 +62,71 @@ SqliteEventFile::Expected<> SqliteEventFile::connect()
     return {};
 }
 
-SqliteEventFile::Expected<> SqliteEventFile::checkOrMakeSchema()
+SqliteEventFile::Expected<> SqliteEventFile::makeSchema()
 {
-    const auto version = number("PRAGMA user_version");
-    const auto objects = version ? number("SELECT count(*) FROM sqlite_schema") : version;
-    if (!objects)
-        return std::unexpected(objects.error());
-    if (*version == schemaVersion)
-        return {};
-    if (*version > schemaVersion)
-        return std::unexpected(StoreError::Newer);
-    if (*version != 0 || *objects != 0)
-        return std::unexpected(StoreError::Corrupt);
-    // Both take effect only before the first page is written.
-    if (const auto done = execute("PRAGMA page_size = 4096; PRAGMA auto_vacuum = INCREMENTAL"); !done)
-        return done;
-    return execute("BEGIN IMMEDIATE;"
-                   "CREATE TABLE events("
-                   "id INTEGER PRIMARY KEY AUTOINCREMENT, time REAL NOT NULL, name TEXT NOT NULL, payload TEXT NOT NULL"
-                   ") STRICT;"
-                   "PRAGMA user_version = 1;"
-                   "COMMIT");
+    return StoreSchema::make(*connection_);
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::configure()
 {
-    const auto pageSize = number("PRAGMA page_size");
+    const auto pageSize = connection_->number("PRAGMA page_size");
     if (!pageSize)
         return std::unexpected(pageSize.error());
     pageSize_ = static_cast<std::uint64_t>(*pageSize);
-    if (const auto done = beginLog(); !done)
-        return done;
-    // The log stays when the last connection closes: without it, users that may not write to the directory could not
-    // read the database either.
-    int keepLog = 1;
-    ::sqlite3_file_control(connection_.get(), "main", SQLITE_FCNTL_PERSIST_WAL, &keepLog);
-    const auto noteLog = [](void* database, sqlite3*, const char*, int pages) {
-        static_cast<SqliteEventFile*>(database)->logPages_ = static_cast<std::uint64_t>(pages);
-        return SQLITE_OK;
-    };
-    ::sqlite3_wal_hook(connection_.get(), noteLog, this); // in place of SQLite's automatic checkpoints
-    return execute(fmt::format("PRAGMA journal_size_limit = {}", mostLogKept).c_str());
-}
-
-SqliteEventFile::Expected<> SqliteEventFile::beginLog()
-{
-    const auto statement = prepare("PRAGMA journal_mode = WAL");
-    if (!statement)
-        return std::unexpected(statement.error());
-    if (::sqlite3_step(statement->get()) != SQLITE_ROW)
-        return std::unexpected(lastError());
-    const auto* mode = reinterpret_cast<const char*>(::sqlite3_column_text(statement->get(), 0));
-    if (std::string_view(mode) != "wal")
-        return std::unexpected(StoreError::CannotOpen); // the file system cannot share memory between processes
-    return {};
+    return connection_->beginLog();
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
 {
-    const std::string insertOne = "INSERT INTO events(time, name, payload) VALUES (?, ?, ?)";
-    std::string insertMany = insertOne;
-    for (std::size_t row = 1; row < rowsAtOnce; ++row)
-        insertMany += ", (?, ?, ?)";
-    const std::initializer_list<std::pair<Statement*, std::string_view>> wanted = {
+    // A database with another schema fails here.
+    const auto corruptIfOther = [](StoreError error) {
+        return std::unexpected(error == StoreError::Other ? StoreError::Corrupt : error);
+    };
+    auto counts = StoreCountsRow::open(*connection_);
+    if (!counts)
+        return corruptIfOther(counts.error());
+    counts_ = std::move(*counts);
+    auto kinds = EventKinds::open(*connection_);
+    if (!kinds)
+        return corruptIfOther(kinds.error());
+    kinds_ = std::move(*kinds);
+    auto originRows = OriginRows::open(*connection_);
+    if (!originRows)
+        return corruptIfOther(originRows.error());
+    originRows_ = std::move(*originRows);
+    auto firstEdition = FirstEdition::open(*connection_);
+    if (!firstEdition)
+        return corruptIfOther(firstEdition.error());
+    firstEdition_ = std::move(*firstEdition);
+
+    constexpr std::string_view columns = "SELECT m.id, 1 + (k.second_name IS NOT NULL), length(CAST(m.payload AS BLOB))"
+                                         " FROM messages m JOIN kinds k ON k.id = m.kind";
+    const std::initializer_list<std::pair<SqliteStatement*, std::string>> wanted = {
         {&begin_, "BEGIN IMMEDIATE"},
         {&commit_, "COMMIT"},
-        {&insertOne_, insertOne},
-        {&insertMany_, insertMany},
-        {&deleteBefore_, "DELETE FROM events WHERE time < ? AND id < (SELECT min(id) FROM events) + ?"},
-        {&sizesOfOldest_, "SELECT id, length(CAST(payload AS BLOB)) FROM events ORDER BY id LIMIT ?"},
-        {&deleteUpTo_, "DELETE FROM events WHERE id <= ?"}};
+        {&insert_,
+         "INSERT INTO messages(id, time, kind, session, source, happened, payload) VALUES (?, ?, ?, ?, ?, ?, ?)"},
+        {&selectBefore_, fmt::format("{} WHERE m.kind IN (SELECT id FROM kinds) AND m.time < ?2 LIMIT ?1", columns)},
+        {&selectOldest_, fmt::format("{} ORDER BY m.id LIMIT ?1", columns)},
+        {&delete_, "DELETE FROM messages WHERE id = ?"}};
     for (const auto& [statement, sql] : wanted) {
-        auto prepared = prepare(sql);
+        auto prepared = connection_->prepare(sql);
         if (!prepared)
-            return std::unexpected(prepared.error() == StoreError::Other ? StoreError::Corrupt // it has another schema
-                                                                         : prepared.error());
+            return corruptIfOther(prepared.error());
         *statement = std::move(*prepared);
     }
     return {};
 }
 
-SqliteEventFile::Expected<> SqliteEventFile::countEvents()
+// A database that this run has not seen yet has no rows of its sources and sessions.
+SqliteEventFile::Expected<> SqliteEventFile::recogniseOrigins()
 {
-    const auto count = number("SELECT count(*) FROM events");
-    if (!count)
-        return std::unexpected(count.error());
-    eventsAtOpening_ = static_cast<std::uint64_t>(*count);
-    return {};
+    if (origins_.epoch == counts_.epoch())
+        return {};
+    origins_.epoch = counts_.epoch();
+    origins_.sources.forgetRows();
+    origins_.sessions.forgetRows();
+    return inTransaction([this] { return originRows_.closeEarlierRun(counts_.counts()); });
 }
 
 bool SqliteEventFile::wasReplaced() const
@@ -213,80 +137,105 @@ bool SqliteEventFile::wasReplaced() const
 
 SqliteEventFile::Expected<> SqliteEventFile::setSynchronization(StoreSynchronization synchronization)
 {
-    return execute(synchronization == StoreSynchronization::Full ? "PRAGMA synchronous = FULL"
-                                                                 : "PRAGMA synchronous = NORMAL");
+    return connection_->execute(synchronization == StoreSynchronization::Full ? "PRAGMA synchronous = FULL"
+                                                                              : "PRAGMA synchronous = NORMAL");
 }
 
 // --- Writing
 
 SqliteEventFile::Expected<> SqliteEventFile::begin()
 {
-    return run(begin_);
+    return begin_.run();
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::insert(std::span<const EventRow> rows)
 {
-    while (!rows.empty()) {
-        const std::size_t number = rows.size() >= rowsAtOnce ? rowsAtOnce : 1;
-        const Statement& statement = number == 1 ? insertOne_ : insertMany_;
-        for (std::size_t row = 0; row < number; ++row)
-            bind(statement, count(3 * row + 1), rows[row]);
-        if (const auto done = run(statement); !done)
+    StoreCounts& counts = counts_.counts();
+    for (const EventRow& row : rows) {
+        if (const auto done = insert(counts.nextEvent, row); !done)
             return done;
-        rows = rows.subspan(number);
+        const auto events = static_cast<std::int64_t>(row.events());
+        counts.nextEvent += events;
+        counts.kept += events;
     }
     return {};
 }
 
-// The statement refers to the texts, so they must stay in place until it has run.
-void SqliteEventFile::bind(const Statement& statement, int firstParameter, const EventRow& row)
+SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const EventRow& row)
 {
-    const auto bindText = [&statement](int parameter, std::string_view text) {
-        return ::sqlite3_bind_text(statement.get(), parameter, text.data(), count(text.size()), SQLITE_STATIC)
-            == SQLITE_OK;
-    };
-    [[maybe_unused]] const bool areBound = // no copy; every event is far shorter than SQLite's limit
-        ::sqlite3_bind_double(statement.get(), firstParameter, row.time) == SQLITE_OK
-        && bindText(firstParameter + 1, row.name) && bindText(firstParameter + 2, row.payload);
-    assert(areBound);
+    const auto kind = kinds_.idOf(row.name, row.secondName);
+    if (!kind)
+        return std::unexpected(kind.error());
+    insert_.bind(1, id);
+    insert_.bind(2, row.time);
+    insert_.bind(3, *kind);
+    const auto rows = originRows_.of(row.origin, origins_, counts_.counts());
+    if (!rows)
+        return std::unexpected(rows.error());
+    insert_.bind(4, rows->session);
+    insert_.bind(5, rows->source);
+    insert_.bind(6, row.happened);
+    insert_.bind(7, row.payload); // every payload is far shorter than SQLite's limit
+    return insert_.run();
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::commit()
 {
-    return run(commit_);
+    if (const auto done = originRows_.writeChanges(origins_, counts_.counts()); !done)
+        return done;
+    if (const auto done = counts_.write(); !done)
+        return done;
+    if (const auto done = commit_.run(); !done)
+        return done;
+    counts_.noteCommit();
+    origins_.committed();
+    return {};
 }
 
 void SqliteEventFile::rollBack()
 {
-    if (::sqlite3_get_autocommit(connection_.get()) == 0)
-        ::sqlite3_exec(connection_.get(), "ROLLBACK", nullptr, nullptr, nullptr);
+    connection_->rollBack();
+    counts_.rolledBack();
+    kinds_.rolledBack();
+    origins_.rolledBack();
+}
+
+// --- The first edition
+
+SqliteEventFile::Expected<> SqliteEventFile::moveFirstEdition()
+{
+    const auto messages = firstEdition_->next();
+    if (!messages)
+        return std::unexpected(messages.error());
+    if (messages->empty()) {
+        firstEdition_.reset();
+        return StoreSchema::dropFirstEdition(*connection_);
+    }
+    return inTransaction([&]() -> Expected<> {
+        for (const auto& [id, time, happened, name, secondName, payload] : *messages)
+            if (const auto done = insert(id, {time, happened, {}, name, secondName, payload}); !done)
+                return done;
+        return firstEdition_->remove(*messages, counts_.counts());
+    });
 }
 
 // --- Limits
 
-bool SqliteEventFile::emptyLog(std::chrono::milliseconds wait)
-{
-    ::sqlite3_busy_timeout(connection_.get(), count(wait.count()));
-    const int done =
-        ::sqlite3_wal_checkpoint_v2(connection_.get(), "main", SQLITE_CHECKPOINT_RESTART, nullptr, nullptr);
-    ::sqlite3_busy_timeout(connection_.get(), count(longestWaitForLock.count()));
-    if (done == SQLITE_OK)
-        logPages_ = 0;
-    return done == SQLITE_OK;
-}
-
 SqliteEventFile::Expected<double> SqliteEventFile::oldest()
 {
-    const auto statement = prepare("SELECT time FROM events ORDER BY id LIMIT 1");
+    const auto statement = connection_->prepare("SELECT time FROM messages ORDER BY id LIMIT 1");
     if (!statement)
         return std::unexpected(statement.error());
-    return ::sqlite3_step(statement->get()) == SQLITE_ROW ? ::sqlite3_column_double(statement->get(), 0) : 0;
+    const auto row = statement->step();
+    if (!row)
+        return std::unexpected(row.error());
+    return *row ? statement->real(0) : 0;
 }
 
 SqliteEventFile::Expected<SqliteEventFile::Size> SqliteEventFile::size()
 {
-    const auto pages = number("PRAGMA page_count");
-    const auto free = pages ? number("PRAGMA freelist_count") : pages;
+    const auto pages = connection_->number("PRAGMA page_count");
+    const auto free = pages ? connection_->number("PRAGMA freelist_count") : pages;
     if (!free)
         return std::unexpected(free.error());
     return Size{.usedBytes = static_cast<std::uint64_t>(*pages - *free) * pageSize_,
@@ -295,87 +244,52 @@ SqliteEventFile::Expected<SqliteEventFile::Size> SqliteEventFile::size()
 
 SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteBefore(double time, std::uint64_t most)
 {
-    ::sqlite3_bind_double(deleteBefore_.get(), 1, time);
-    ::sqlite3_bind_int64(deleteBefore_.get(), 2, static_cast<std::int64_t>(most));
-    return runAndCountChanges(deleteBefore_);
+    selectBefore_.bind(1, most);
+    selectBefore_.bind(2, time);
+    return deleteSelected(selectBefore_, UINT64_MAX);
 }
 
 SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOldest(std::uint64_t bytes, std::uint64_t most)
 {
-    ::sqlite3_bind_int64(sizesOfOldest_.get(), 1, static_cast<std::int64_t>(most));
-    std::int64_t last = 0;
-    std::uint64_t counted = 0;
-    int step = SQLITE_ROW;
-    while (counted < bytes && (step = ::sqlite3_step(sizesOfOldest_.get())) == SQLITE_ROW) {
-        last = ::sqlite3_column_int64(sizesOfOldest_.get(), 0);
-        counted += static_cast<std::uint64_t>(::sqlite3_column_int64(sizesOfOldest_.get(), 1));
+    selectOldest_.bind(1, most);
+    return deleteSelected(selectOldest_, bytes);
+}
+
+SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteSelected(const SqliteStatement& select,
+                                                                         std::uint64_t bytes)
+{
+    std::vector<std::int64_t> ids;
+    std::int64_t events = 0;
+    for (std::uint64_t counted = 0; counted < bytes;) {
+        const auto row = select.step();
+        if (!row)
+            return std::unexpected(row.error());
+        if (!*row)
+            break;
+        ids.push_back(select.integer(0));
+        events += select.integer(1);
+        counted += static_cast<std::uint64_t>(select.integer(2));
     }
-    if (step != SQLITE_ROW && step != SQLITE_DONE) {
-        const StoreError error = lastError();
-        ::sqlite3_reset(sizesOfOldest_.get());
-        return std::unexpected(error);
-    }
-    ::sqlite3_reset(sizesOfOldest_.get());
-    ::sqlite3_bind_int64(deleteUpTo_.get(), 1, last);
-    return runAndCountChanges(deleteUpTo_);
+    select.reset();
+    if (ids.empty())
+        return 0;
+    const auto done = inTransaction([&]() -> Expected<> {
+        for (const std::int64_t id : ids) {
+            delete_.bind(1, id);
+            if (const auto deleted = delete_.run(); !deleted)
+                return deleted;
+        }
+        counts_.counts().removed += events;
+        return {};
+    });
+    if (!done)
+        return std::unexpected(done.error());
+    return static_cast<std::uint64_t>(events);
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::shrink(std::uint64_t mostBytes)
 {
-    return execute(fmt::format("PRAGMA incremental_vacuum({})", mostBytes / pageSize_).c_str());
-}
-
-// --- SQLite
-
-StoreError SqliteEventFile::lastError() const
-{
-    return errorOf(connection_.get());
-}
-
-SqliteEventFile::Expected<> SqliteEventFile::execute(const char* sql)
-{
-    if (::sqlite3_exec(connection_.get(), sql, nullptr, nullptr, nullptr) == SQLITE_OK)
-        return {};
-    return std::unexpected(lastError());
-}
-
-SqliteEventFile::Expected<std::int64_t> SqliteEventFile::number(const char* sql)
-{
-    const auto statement = prepare(sql);
-    if (!statement)
-        return std::unexpected(statement.error());
-    if (::sqlite3_step(statement->get()) != SQLITE_ROW)
-        return std::unexpected(lastError());
-    return ::sqlite3_column_int64(statement->get(), 0);
-}
-
-SqliteEventFile::Expected<SqliteEventFile::Statement> SqliteEventFile::prepare(std::string_view sql)
-{
-    sqlite3_stmt* statement = nullptr;
-    if (::sqlite3_prepare_v3(connection_.get(), sql.data(), count(sql.size()), SQLITE_PREPARE_PERSISTENT, &statement,
-                             nullptr)
-        != SQLITE_OK)
-        return std::unexpected(lastError());
-    return Statement(statement);
-}
-
-SqliteEventFile::Expected<> SqliteEventFile::run(const Statement& statement)
-{
-    const int done = ::sqlite3_step(statement.get());
-    if (done == SQLITE_DONE || done == SQLITE_ROW) {
-        ::sqlite3_reset(statement.get());
-        return {};
-    }
-    const StoreError error = lastError(); // before the statement is reset
-    ::sqlite3_reset(statement.get());
-    return std::unexpected(error);
-}
-
-SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::runAndCountChanges(const Statement& statement)
-{
-    if (const auto done = run(statement); !done)
-        return std::unexpected(done.error());
-    return static_cast<std::uint64_t>(::sqlite3_changes64(connection_.get()));
+    return connection_->execute(fmt::format("PRAGMA incremental_vacuum({})", mostBytes / pageSize_).c_str());
 }
 
 } // namespace platform

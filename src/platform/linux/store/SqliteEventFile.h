@@ -1,43 +1,37 @@
 // The SQLite file of the analytics store: it writes events and keeps the file within its limits.
 //
-// Only this connection writes and checkpoints, because SQLite 3.40 can damage a database when two connections do so at
-// the same time. A lock on the directory keeps a second service away; all other programs open the file read-only. The
-// log is written ahead (WAL): readers and the writer do not delay each other, and committed events survive the end of
-// the process.
+// Only this connection writes and checkpoints. A lock on the directory keeps a second service away; all other programs
+// open the file read-only. The log is written ahead (WAL): readers and the writer do not delay each other, and
+// committed events survive the end of the process.
 #pragma once
 
 #include "platform/EventBatch.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
-#include "platform/linux/store/StoreError.h"
+#include "platform/linux/store/EventKinds.h"
+#include "platform/linux/store/FirstEdition.h"
+#include "platform/linux/store/OriginRows.h"
+#include "platform/linux/store/SqliteConnection.h"
+#include "platform/linux/store/StoreSchema.h"
 
 #include <chrono>
 #include <cstdint>
-#include <expected>
 #include <filesystem>
 #include <memory>
+#include <optional>
 #include <span>
-#include <string_view>
-
-struct sqlite3;
-struct sqlite3_stmt;
 
 namespace platform {
 
 // One thread at a time.
 class SqliteEventFile {
 public:
-    template <typename Result = void> using Expected = std::expected<Result, StoreError>;
+    template <typename Result = void> using Expected = StoreExpected<Result>;
 
-    static constexpr int schemaVersion = 1;
-    // One statement inserts many rows: AUTOINCREMENT does its accounting once for each statement, which costs as much
-    // as a row.
-    static constexpr std::size_t rowsAtOnce = 16;
-    // How long a program that locks the database may delay the store.
-    static constexpr std::chrono::milliseconds longestWaitForLock{2000};
-
-    // Opens the file, or makes it. A file that is corrupt or of a later version stays as it is.
-    [[nodiscard]] static Expected<std::unique_ptr<SqliteEventFile>> open(const std::filesystem::path& path);
+    // Opens the file, or makes it. A file that is corrupt or of a later edition stays as it is. The origins, which must
+    // outlive the file, are those of this run.
+    [[nodiscard]] static Expected<std::unique_ptr<SqliteEventFile>> open(const std::filesystem::path& path,
+                                                                         KnownOrigins& origins);
     SqliteEventFile(const SqliteEventFile&) = delete;
     SqliteEventFile& operator=(const SqliteEventFile&) = delete;
     ~SqliteEventFile();
@@ -53,15 +47,21 @@ public:
     [[nodiscard]] Expected<> commit();
     void rollBack();
 
+    // Whether events of the first edition are still to be moved.
+    [[nodiscard]] bool hasFirstEdition() const noexcept { return firstEdition_.has_value(); }
+    // Moves some of them, in a transaction.
+    [[nodiscard]] Expected<> moveFirstEdition();
+
     // The size of the write-ahead log after the last commit.
-    [[nodiscard]] std::uint64_t logBytes() const noexcept { return logPages_ * pageSize_; }
+    [[nodiscard]] std::uint64_t logBytes() const noexcept { return connection_->logPages() * pageSize_; }
     // Moves the log to the database, as far as readers allow. With a wait it blocks the writer, but no reader, until
     // the readers in its way have finished. True if all was moved and no reader needs the log, so that the next commit
     // starts it again. False also after an error of the disk: a log can be moved later.
-    [[nodiscard]] bool emptyLog(std::chrono::milliseconds wait = {});
+    [[nodiscard]] bool emptyLog(std::chrono::milliseconds wait = {}) { return connection_->emptyLog(wait); }
 
-    // The events that were in the file when it was opened.
-    [[nodiscard]] std::uint64_t eventsAtOpening() const noexcept { return eventsAtOpening_; }
+    // How many events are in the file. While events of the first edition are left, those that are missing among them
+    // count too.
+    [[nodiscard]] std::uint64_t events() const noexcept { return counts_.committed().events(); }
     // The time of the first event; 0 without events.
     [[nodiscard]] Expected<double> oldest();
     struct Size {
@@ -69,55 +69,43 @@ public:
         std::uint64_t freeBytes = 0; // room in the file that no event uses
     };
     [[nodiscard]] Expected<Size> size();
-    // Of the `most` oldest events, deletes those before that time. Returns their number.
+    // Deletes messages that were sent before that time, at most `most`. Returns how many events they were.
     [[nodiscard]] Expected<std::uint64_t> deleteBefore(double time, std::uint64_t most);
-    // Deletes the oldest events until they have freed so many bytes, but at most `most` of them. Returns their number.
+    // Deletes the oldest messages until they have freed so many bytes, but at most `most` of them. Returns how many
+    // events they were.
     [[nodiscard]] Expected<std::uint64_t> deleteOldest(std::uint64_t bytes, std::uint64_t most);
     // Returns free room of the file to the file system, at most so many bytes.
     [[nodiscard]] Expected<> shrink(std::uint64_t mostBytes);
 
 private:
-    struct CloseConnection {
-        void operator()(sqlite3* connection) const noexcept;
-    };
-    struct FinalizeStatement {
-        void operator()(sqlite3_stmt* statement) const noexcept;
-    };
-    using Statement = std::unique_ptr<sqlite3_stmt, FinalizeStatement>;
-
-    explicit SqliteEventFile(std::filesystem::path path) : path_(std::move(path)) { }
+    SqliteEventFile(std::filesystem::path path, KnownOrigins& origins) : path_(std::move(path)), origins_(origins) { }
     [[nodiscard]] Expected<> lockDirectory();
     [[nodiscard]] Expected<> connect();
-    [[nodiscard]] Expected<> checkOrMakeSchema();
+    [[nodiscard]] Expected<> makeSchema();
     [[nodiscard]] Expected<> configure();
-    [[nodiscard]] Expected<> beginLog();
     [[nodiscard]] Expected<> prepareStatements();
-    [[nodiscard]] Expected<> countEvents();
-
-    [[nodiscard]] StoreError lastError() const;
-    [[nodiscard]] Expected<> execute(const char* sql);
-    [[nodiscard]] Expected<std::int64_t> number(const char* sql);
-    [[nodiscard]] Expected<Statement> prepare(std::string_view sql);
-    // Runs the statement to its first row or to its end, and resets it.
-    [[nodiscard]] Expected<> run(const Statement& statement);
-    [[nodiscard]] Expected<std::uint64_t> runAndCountChanges(const Statement& statement);
-    static void bind(const Statement& statement, int firstParameter, const EventRow& row);
+    [[nodiscard]] Expected<> recogniseOrigins();
+    [[nodiscard]] Expected<> insert(std::int64_t id, const EventRow& row);
+    template <typename Work> [[nodiscard]] Expected<> inTransaction(Work work);
+    [[nodiscard]] Expected<std::uint64_t> deleteSelected(const SqliteStatement& select, std::uint64_t bytes);
 
     const std::filesystem::path path_;
+    KnownOrigins& origins_;
     FileDescriptor directoryLock_;
-    std::unique_ptr<sqlite3, CloseConnection> connection_;
+    std::unique_ptr<SqliteConnection> connection_; // outlives the statements below
     std::uint64_t device_ = 0; // with the inode, identifies the file under any name
     std::uint64_t inode_ = 0;
     std::uint64_t pageSize_ = 0;
-    std::uint64_t eventsAtOpening_ = 0;
-    std::uint64_t logPages_ = 0;
-    Statement begin_;
-    Statement commit_;
-    Statement insertMany_;
-    Statement insertOne_;
-    Statement deleteBefore_;
-    Statement sizesOfOldest_;
-    Statement deleteUpTo_;
+    StoreCountsRow counts_;
+    EventKinds kinds_;
+    OriginRows originRows_;
+    std::optional<FirstEdition> firstEdition_;
+    SqliteStatement begin_;
+    SqliteStatement commit_;
+    SqliteStatement insert_;
+    SqliteStatement selectBefore_;
+    SqliteStatement selectOldest_;
+    SqliteStatement delete_;
 };
 
 } // namespace platform

@@ -2,6 +2,8 @@
 // good.
 #include "platform/linux/store/SqliteKeeper.h"
 
+#include "platform/linux/files/SmallFile.h"
+
 #include <algorithm>
 #include <array>
 #include <fmt/chrono.h>
@@ -14,7 +16,7 @@ namespace {
 
 namespace fs = std::filesystem;
 
-constexpr std::uint64_t bytesOfARow = 24; // besides its texts, roughly
+constexpr std::uint64_t bytesOfARow = 64; // besides its payload, roughly
 constexpr std::uint64_t bytesTidiedAtOnce = 1024 * 1024;
 constexpr double secondsADay = 86400;
 
@@ -29,6 +31,16 @@ constexpr std::string_view newerMark = ".newer-";
 // The files that SQLite keeps beside a database, by the ends of their names.
 constexpr std::array<std::string_view, 2> companions = {"-wal", "-shm"};
 
+// Empty where the kernel does not say it.
+std::string bootIdentifier()
+{
+    constexpr std::size_t longest = 64;
+    std::string text = readSmallFile("/proc/sys/kernel/random/boot_id", longest).value_or(std::string());
+    if (text.ends_with('\n'))
+        text.pop_back();
+    return text;
+}
+
 } // namespace
 
 SqliteKeeper::SqliteKeeper(const fs::path& directory, const Clock& clock, ProviderLog log)
@@ -37,6 +49,7 @@ SqliteKeeper::SqliteKeeper(const fs::path& directory, const Clock& clock, Provid
       log_(log),
       losses_(path_, clock, log)
 {
+    origins_.bootIdentifier = bootIdentifier();
 }
 
 void SqliteKeeper::setConfiguration(const AnalyticsConfiguration& configuration)
@@ -84,14 +97,15 @@ SqliteKeeper::Expected<> SqliteKeeper::ensureOpen()
 
 SqliteKeeper::Expected<> SqliteKeeper::openAnew()
 {
-    auto opened = SqliteEventFile::open(path_);
+    auto opened = SqliteEventFile::open(path_, origins_);
     if (!opened && (opened.error() == StoreError::Corrupt || opened.error() == StoreError::Newer)
         && setAside(opened.error()))
-        opened = SqliteEventFile::open(path_);
+        opened = SqliteEventFile::open(path_, origins_);
     if (!opened)
         return std::unexpected(opened.error());
     database_ = std::move(*opened);
-    state_ = {.events = database_->eventsAtOpening(), .bytes = 0, .oldest = 0};
+    bytes_ = 0;
+    oldest_ = 0;
     hasMoreToTidy_ = true; // which also completes the state
     logBytesAtCheckpoint_ = 0;
     return database_->setSynchronization(configuration_.synchronization);
@@ -146,19 +160,25 @@ void SqliteKeeper::removeOldestDamaged()
 
 void SqliteKeeper::keep(EventBatch& events, ledger::Tally& tally)
 {
-    if (events.size() == 0)
+    if (events.empty())
         return;
+    origins_.begin(events.announcements());
     const auto rows = events.rows();
-    lose(StoreError::NotJson, events.size() - rows.size(), tally);
-    auto done = write(rows);
+    std::uint64_t count = 0;
+    for (const EventRow& row : rows)
+        count += row.events();
+    lose(StoreError::NotJson, events.size() - count, tally);
+    const OriginAnnouncements& announced = events.announcements();
+    if (rows.empty() && !endsRows(announced))
+        return losses_.report();
+    auto done = write(rows, announced);
     if (!done && done.error() == StoreError::Corrupt)
-        done = write(rows); // now into a new database
-    if (done) {
-        tally.add(ledger::Counter::Kept, rows.size());
-        state_.events += rows.size();
-    } else {
-        lose(done.error(), rows.size(), tally);
-    }
+        done = write(rows, announced); // now into a new database
+    origins_.end(announced); // also where nothing could be written
+    if (done)
+        tally.add(ledger::Counter::Kept, count);
+    else
+        lose(done.error(), count, tally);
     losses_.report();
 }
 
@@ -170,10 +190,22 @@ void SqliteKeeper::lose(StoreError reason, std::uint64_t events, ledger::Tally& 
 
 std::optional<ledger::StoreState> SqliteKeeper::state() const
 {
-    return database_ ? std::optional(state_) : std::nullopt;
+    if (!database_)
+        return std::nullopt;
+    return ledger::StoreState{.events = database_->events(), .bytes = bytes_, .oldest = oldest_};
 }
 
-SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows)
+// Whether rows are to be written although there is no event. What has no row yet waits for one.
+bool SqliteKeeper::endsRows(const OriginAnnouncements& announced)
+{
+    origins_.end(announced);
+    if (database_ && origins_.hasChanged())
+        return true;
+    origins_.committed();
+    return false;
+}
+
+SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows, const OriginAnnouncements& announced)
 {
     const auto insertAll = [&]() -> Expected<> {
         if (const auto done = ensureOpen(); !done)
@@ -184,6 +216,7 @@ SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows)
             return done;
         if (const auto done = database_->insert(rows); !done)
             return done;
+        origins_.end(announced); // behind its events
         return database_->commit();
     };
     const auto done = insertAll();
@@ -192,7 +225,7 @@ SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows)
         return done;
     }
     for (const EventRow& row : rows)
-        bytesSinceCheck_ += bytesOfARow + row.name.size() + row.payload.size();
+        bytesSinceCheck_ += bytesOfARow + row.payload.size();
     return done;
 }
 
@@ -224,6 +257,8 @@ bool SqliteKeeper::tidy(bool isQuiet, ledger::Tally& tally)
         logBytesAtCheckpoint_ = 0; // the log started again
     if (isLogLongerBy(isQuiet ? logBytesBetweenCheckpoints : mostLogBytesBetweenCheckpoints))
         emptyLog();
+    if (database_->hasFirstEdition() && database_->logBytes() <= maximumBytes())
+        return moveFirstEdition(tally);
     const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
         || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
     hasMoreToTidy_ =
@@ -248,6 +283,18 @@ bool SqliteKeeper::emptyLog()
     return isEmpty;
 }
 
+// The limits wait: what is moved takes half the room. True if more is left to do.
+bool SqliteKeeper::moveFirstEdition(ledger::Tally& tally)
+{
+    const std::uint64_t before = database_->events();
+    if (const auto done = database_->moveFirstEdition(); !done) {
+        handleFailure(done.error());
+        return false;
+    }
+    tally.add(ledger::Counter::RemovedForAge, before - database_->events()); // those that it found missing
+    return true;
+}
+
 // Frees more room than events have taken since the last call, so that it keeps up, but only a part of all that is due.
 // True if more is left to do.
 bool SqliteKeeper::makeRoom(ledger::Tally& tally)
@@ -259,7 +306,7 @@ bool SqliteKeeper::makeRoom(ledger::Tally& tally)
     auto size = database_->size();
     const std::uint64_t roomBefore = size ? room(*size) : 0;
     while (size && room(*size) + mostFreed > roomBefore) {
-        state_.bytes = size->usedBytes + size->freeBytes + database_->logBytes();
+        bytes_ = size->usedBytes + size->freeBytes + database_->logBytes();
         const auto hasMore = makeSomeRoom(*size, tally);
         if (hasMore && !*hasMore)
             return false;
@@ -280,8 +327,7 @@ SqliteKeeper::Expected<bool> SqliteKeeper::makeSomeRoom(const SqliteEventFile::S
     if (!deleted)
         return std::unexpected(deleted.error());
     tally.add(isTooLarge ? ledger::Counter::RemovedForSize : ledger::Counter::RemovedForAge, *deleted);
-    state_.events -= *deleted;
-    state_.oldest = database_->oldest().value_or(0);
+    oldest_ = database_->oldest().value_or(0);
     // New events fill the room of deleted ones; the file shrinks only if far too much of it is free.
     const bool isFileTooLarge = size.usedBytes + size.freeBytes > maximumBytes() + maximumBytes() / 8;
     if (*deleted > 0 || !isFileTooLarge || size.freeBytes == 0)

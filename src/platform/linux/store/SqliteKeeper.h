@@ -56,11 +56,13 @@ private:
     [[nodiscard]] Expected<> openAnew();
     bool setAside(StoreError reason);
     void removeOldestDamaged();
-    [[nodiscard]] Expected<> write(std::span<const EventRow> rows);
+    [[nodiscard]] Expected<> write(std::span<const EventRow> rows, const OriginAnnouncements& announced);
+    [[nodiscard]] bool endsRows(const OriginAnnouncements& announced);
     void handleFailure(StoreError error);
     void lose(StoreError reason, std::uint64_t events, ledger::Tally& tally);
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     bool emptyLog();
+    [[nodiscard]] bool moveFirstEdition(ledger::Tally& tally);
     [[nodiscard]] bool makeRoom(ledger::Tally& tally);
     [[nodiscard]] Expected<bool> makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally);
     [[nodiscard]] std::uint64_t maximumBytes() const noexcept;
@@ -70,9 +72,11 @@ private:
     const ProviderLog log_;
     AnalyticsConfiguration configuration_;
     EventLosses losses_;
+    KnownOrigins origins_;
 
     std::unique_ptr<SqliteEventFile> database_; // null: could not be opened
-    ledger::StoreState state_; // of the database; bytes and oldest event as of the last check
+    std::uint64_t bytes_ = 0; // of the database, as of the last check, as the next
+    double oldest_ = 0; // the time of its first event; 0 without events
     StoreError openError_ = StoreError::Other;
     double openAgainAt_ = 0; // here and below: uptime, in seconds
     std::uint64_t logBytesAtCheckpoint_ = 0;

@@ -55,11 +55,11 @@ protected:
 
     void send(std::int64_t number, const char* name = eventName)
     {
-        store().sendAnalyticsEventLazy(outsideTurn, name, [number] { return Dictionary{{"n", number}}; });
+        store().sendAnalyticsEventLazy(outsideTurn, {}, name, [number] { return Dictionary{{"n", number}}; });
     }
     void sendIn(Turn& turn, std::int64_t number)
     {
-        store().sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });
+        store().sendAnalyticsEventLazy(turn, {}, eventName, [number] { return Dictionary{{"n", number}}; });
     }
     // Sends in a turn, and ends the turn as the service does.
     void runTurn(std::function<void(Turn&)> items, AnalyticsStore::WhenKept whenKept)
@@ -78,7 +78,7 @@ protected:
     void sendALongLog()
     {
         for (int number = 0; number < 120; ++number)
-            store().sendAnalyticsEventLazy(outsideTurn, eventName,
+            store().sendAnalyticsEventLazy(outsideTurn, {}, eventName,
                                            [] { return Dictionary{{"text", std::string(100'000, 'x')}}; });
         store().flush();
     }
@@ -91,7 +91,7 @@ protected:
         explicit Hold(AnalyticsStore& store)
         {
             std::promise<void> held;
-            store.sendAnalyticsEventLazy(outsideTurn, "com.quarn.hold", [] { return Dictionary(); });
+            store.sendAnalyticsEventLazy(outsideTurn, {}, "com.quarn.hold", [] { return Dictionary(); });
             Turn turn;
             store.endTurn(turn, [&held, released = released_.get_future()] {
                 held.set_value();
@@ -141,7 +141,7 @@ TEST_F(AnalyticsStoreTest, BuildsThePayloadOnceAndWhenTheEventIsSent)
 {
     int built = 0;
     const auto sender = std::this_thread::get_id();
-    store().sendAnalyticsEventLazy(outsideTurn, eventName, [&] {
+    store().sendAnalyticsEventLazy(outsideTurn, {}, eventName, [&] {
         ++built;
         EXPECT_EQ(std::this_thread::get_id(), sender);
         return Dictionary{{"key", "value"}};
@@ -396,9 +396,9 @@ TEST_F(AnalyticsStoreTest, TooManyBytesMakeTheEndOfATurnWait)
         sender = std::jthread([&] {
             runTurn(
                 [&](Turn& turn) {
-                    store().sendAnalyticsEventLazy(turn, eventName,
+                    store().sendAnalyticsEventLazy(turn, {}, eventName,
                                                    [] { return Dictionary{{"text", std::string(99'000, 'x')}}; });
-                    store().sendAnalyticsEventLazy(turn, eventName,
+                    store().sendAnalyticsEventLazy(turn, {}, eventName,
                                                    [] { return Dictionary{{"text", std::string(99'000, 'y')}}; });
                 },
                 {});
@@ -419,7 +419,7 @@ TEST_F(AnalyticsStoreTest, APayloadThatTwoEventsShareCountsOnce)
     const Dictionary payload{{"text", std::string(60'000, 'x')}};
     send(1);
     for (int number = 0; number < 2; ++number) // if both counted, the second would wait for ever
-        store().sendAnalyticsEventLazy(outsideTurn, eventName, [&] { return payload; });
+        store().sendAnalyticsEventLazy(outsideTurn, {}, eventName, [&] { return payload; });
 }
 
 TEST_F(AnalyticsStoreTest, ATurnLargerThanTheBacklogIsKeptWhole)
@@ -469,7 +469,7 @@ TEST_F(AnalyticsStoreTest, KillingTheServiceLosesNothingThatWasAcknowledged)
                                        childsWatcher, clock, childsLedger, ProviderLog(log));
             Turn turn;
             for (std::int64_t number = 1;; ++number) {
-                childsStore.sendAnalyticsEventLazy(turn, eventName, [number] { return Dictionary{{"n", number}}; });
+                childsStore.sendAnalyticsEventLazy(turn, {}, eventName, [number] { return Dictionary{{"n", number}}; });
                 childsStore.endTurn(turn, [number, &channel] {
                     if (::write(channel[1], &number, sizeof number) != sizeof number)
                         ::_exit(1);
@@ -565,8 +565,8 @@ TEST_F(AnalyticsStoreTest, CountsWhatBecameOfEachEvent)
     Turn turn;
     sendIn(turn, 1);
     sendIn(turn, 2);
-    store().sendAnalyticsEventLazy(turn, "com.quarn.other", [] { return Dictionary(); });
-    store().sendAnalyticsEventLazy(turn, eventName,
+    store().sendAnalyticsEventLazy(turn, {}, "com.quarn.other", [] { return Dictionary(); });
+    store().sendAnalyticsEventLazy(turn, {}, eventName,
                                    [] { return Dictionary{{"n", std::numeric_limits<double>::infinity()}}; });
     turn.tally.add(Counter::Deliveries, 4);
     turn.tally.add(Counter::Recorded, 4);
@@ -629,7 +629,7 @@ TEST_F(AnalyticsStoreTest, EventsInTheDatabaseThatTheLedgerDoesNotKnowAreCounted
     ledger::Ledger fresh;
     AnalyticsStore second(std::make_unique<SqliteKeeper>(temporary.path(), clock, ProviderLog(log)), watcher, clock,
                           fresh, ProviderLog(log));
-    second.sendAnalyticsEventLazy(outsideTurn, eventName, [] { return Dictionary(); });
+    second.sendAnalyticsEventLazy(outsideTurn, {}, eventName, [] { return Dictionary(); });
     second.flush();
     EXPECT_EQ(fresh.account()[Counter::Events], 3U);
     EXPECT_EQ(fresh.account()[Counter::Kept], 3U);

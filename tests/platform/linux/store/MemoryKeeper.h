@@ -51,13 +51,14 @@ public:
     void open() override { }
     void keep(platform::EventBatch& events, ledger::Tally& tally) override
     {
-        const auto rows = events.rows();
-        place_->change([&](std::vector<KeptEvent>& kept) {
-            for (const auto& [time, name, payload] : rows)
-                kept.push_back({time, std::string(name), std::string(payload)});
-        });
-        tally.add(ledger::Counter::Kept, rows.size());
-        tally.add(ledger::Counter::LostNotJson, events.size() - rows.size());
+        std::vector<KeptEvent> given;
+        for (const platform::EventRow& row : events.rows())
+            for (const std::string_view name : {row.name, row.secondName})
+                if (!name.empty())
+                    given.push_back({row.time, std::string(name), std::string(row.payload)});
+        place_->change([&](std::vector<KeptEvent>& kept) { kept.insert(kept.end(), given.begin(), given.end()); });
+        tally.add(ledger::Counter::Kept, given.size());
+        tally.add(ledger::Counter::LostNotJson, events.size() - given.size());
     }
     [[nodiscard]] bool awaitsQuiet() const override { return false; }
     bool tidy(bool, ledger::Tally& tally) override

@@ -125,11 +125,9 @@ TEST_F(SqliteKeeperTest, TheSchemaIsTheOneThatIsPromised)
 {
     keeper().open();
     StoreReader reader(file());
-    EXPECT_EQ(
-        reader.text("SELECT sql FROM sqlite_schema WHERE name = 'events'"),
-        "CREATE TABLE events(id INTEGER PRIMARY KEY AUTOINCREMENT, time REAL NOT NULL, name TEXT NOT NULL, payload "
-        "TEXT NOT NULL) STRICT");
-    EXPECT_EQ(reader.number("PRAGMA user_version"), 1);
+    EXPECT_THAT(reader.texts("SELECT name FROM pragma_table_info('events')"),
+                ElementsAre("id", "time", "name", "payload", "session", "source", "happened"));
+    EXPECT_EQ(reader.number("PRAGMA user_version"), 2);
     EXPECT_EQ(reader.text("PRAGMA journal_mode"), "wal");
     EXPECT_THAT(log.lines(), IsEmpty());
 }
@@ -169,6 +167,115 @@ TEST_F(SqliteKeeperTest, TwoEventsOfOnePayloadBothHaveIt)
     StoreReader reader(file());
     EXPECT_THAT(reader.texts("SELECT name || payload FROM events ORDER BY id"),
                 ElementsAre("a{\"n\":1}", "b{\"n\":1}", "c{\"n\":2}", "d{\"n\":1}"));
+}
+
+TEST_F(SqliteKeeperTest, AMessageWithTwoNamesIsStoredOnce)
+{
+    const Dictionary first{{"n", 1}, {"kestoreporting_timestamp", 1'700'000'000.5}};
+    const Dictionary second{{"n", 2}};
+    keep({event(1, "a", first), event(2, "b", first), event(3, "a", second), event(3, "b", second), event(4, "c")});
+    StoreReader reader(file());
+    EXPECT_EQ(reader.number("SELECT count(*) FROM messages"), 3);
+    EXPECT_THAT(reader.texts("SELECT id || ' ' || time || name || payload FROM events ORDER BY id"),
+                ElementsAre("1 1.0a{\"n\":1,\"kestoreporting_timestamp\":1700000000.5}",
+                            "2 1.0b{\"n\":1,\"kestoreporting_timestamp\":1700000000.5}", "3 3.0a{\"n\":2}",
+                            "4 3.0b{\"n\":2}", "5 4.0c{\"key\":1}"));
+    EXPECT_THAT(reader.texts("SELECT happened FROM events ORDER BY id"),
+                ElementsAre("1700000000.5", "1700000000.5", "NULL", "NULL", "NULL"));
+    EXPECT_EQ(tally[ledger::Counter::Kept], 5U);
+}
+
+TEST_F(SqliteKeeperTest, NamesAreStoredOnce)
+{
+    const Dictionary payload{{"n", 1}};
+    for (int round = 0; round < 3; ++round) {
+        for (int number = 0; number < 10; ++number)
+            keep({event(1, "a", payload), event(1, "b", payload), event(1, "a"), event(1, "c")});
+        closeWriter();
+    }
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name || coalesce('+' || second_name, '') FROM kinds ORDER BY id"),
+                ElementsAre("a+b", "a", "c"));
+    EXPECT_EQ(StoreReader(file()).number("SELECT count(*) FROM events WHERE name = 'a'"), 60);
+}
+
+TEST_F(SqliteKeeperTest, WhatIsThereIsWhatWasKeptLessWhatWasRemoved)
+{
+    const auto counted = [this] { return StoreReader(file()).number("SELECT kept - removed FROM store"); };
+    keeper().open();
+    EXPECT_EQ(counted(), 0);
+    configuration.maximumSizeMegabytes = 1;
+    keeper().setConfiguration(configuration);
+    const Dictionary both{{"text", std::string(300, 'x')}};
+    for (int round = 0; round < 20; ++round) {
+        std::vector<PlainEvent> given;
+        for (int number = 0; number < 100; ++number)
+            for (const char* name : {"a", "b"})
+                given.push_back(event(1'800'000'000, name, both));
+        keep(given);
+        keep(events(150));
+        maintain();
+        ASSERT_EQ(counted(), StoreReader(file()).eventCount());
+    }
+    EXPECT_GT(StoreReader(file()).number("SELECT removed FROM store"), 1000);
+    EXPECT_EQ(StoreReader(file()).number("SELECT kept FROM store"), 7000);
+    EXPECT_EQ(StoreReader(file()).number("SELECT next_event FROM store"), 7001);
+}
+
+TEST_F(SqliteKeeperTest, ATransactionThatFailsCountsNothingAndUsesNoNumbers)
+{
+    keep({event(1, "a")});
+    sqlite3* other = nullptr;
+    ASSERT_EQ(::sqlite3_open(file().c_str(), &other), SQLITE_OK);
+    ASSERT_EQ(::sqlite3_exec(other,
+                             "CREATE TRIGGER refuse BEFORE INSERT ON messages WHEN NEW.time = 7"
+                             " BEGIN SELECT RAISE(ABORT, 'no'); END",
+                             nullptr, nullptr, nullptr),
+              SQLITE_OK);
+    keep({event(1, "b"), event(7, "c")});
+    EXPECT_EQ(lost(StoreError::Other), 2U);
+    ASSERT_EQ(::sqlite3_exec(other, "DROP TRIGGER refuse", nullptr, nullptr, nullptr), SQLITE_OK);
+    ::sqlite3_close(other);
+    log.take();
+    clock.advance(SqliteKeeper::secondsBetweenOpenings);
+    keep({event(1, "b"), event(7, "c")});
+    EXPECT_THAT(StoreReader(file()).texts("SELECT id || name FROM events ORDER BY id"), ElementsAre("1a", "2b", "3c"));
+    EXPECT_EQ(StoreReader(file()).number("SELECT kept - removed FROM store"), 3);
+}
+
+TEST_F(SqliteKeeperTest, EachDatabaseHasAnEpochOfItsOwn)
+{
+    const auto epoch = [this] { return StoreReader(file()).text("SELECT epoch FROM store"); };
+    keep({event(1)});
+    const std::string first = epoch();
+    EXPECT_THAT(first, testing::MatchesRegex("[0-9a-f]{32}"));
+    closeWriter();
+    keep({event(1)});
+    EXPECT_EQ(epoch(), first);
+    fs::remove(file());
+    keep({event(1)});
+    EXPECT_THAT(epoch(), testing::MatchesRegex("[0-9a-f]{32}"));
+    EXPECT_NE(epoch(), first);
+}
+
+TEST_F(SqliteKeeperTest, QueriesOfTheViewUseAnIndex)
+{
+    keeper().open();
+    StoreReader reader(file());
+    const auto plan = [&](const std::string& sql) {
+        std::string text;
+        for (const std::string& step : reader.texts("EXPLAIN QUERY PLAN SELECT * FROM events " + sql, 3))
+            text += step + '\n';
+        return text;
+    };
+    const auto searches = [](const std::string& how) {
+        return AllOf(HasSubstr(how), Not(HasSubstr("SCAN m\n")), Not(HasSubstr("SCAN messages")));
+    };
+    EXPECT_THAT(plan("WHERE name = 'a' AND time > 1"),
+                searches("SEARCH m USING INDEX messages_by_kind (kind=? AND time>?)"));
+    EXPECT_THAT(plan("WHERE time > 1"), searches("SEARCH m USING INDEX messages_by_kind (kind=? AND time>?)"));
+    EXPECT_THAT(plan("WHERE id > 1 ORDER BY id LIMIT 5"),
+                AllOf(searches("SEARCH m USING INTEGER PRIMARY KEY (rowid>?)"), Not(HasSubstr("TEMP B-TREE"))));
+    EXPECT_THAT(plan("ORDER BY id DESC LIMIT 5"), Not(HasSubstr("TEMP B-TREE"))) << "it ends after five rows";
 }
 
 TEST_F(SqliteKeeperTest, NumbersAreNeverUsedTwice)
@@ -249,6 +356,197 @@ TEST_F(SqliteKeeperTest, ALongPayloadIsKeptWhole)
     EXPECT_EQ(StoreReader(file()).number("SELECT length(payload ->> 'text') FROM events WHERE id = 1"), 3'000'000);
 }
 
+// --- Who sent them
+
+class OriginsTest : public SqliteKeeperTest {
+protected:
+    void begin(std::uint64_t source, std::string process = "player", std::uint32_t user = 1000)
+    {
+        batch.announce(SourceBegin{.number = source,
+                                   .userIdentifier = user,
+                                   .processIdentifier = 77,
+                                   .processName = std::move(process),
+                                   .time = 1'700'000'000.5});
+    }
+    void beginSession(std::uint64_t session, std::uint64_t source, std::string application = "org.example.a")
+    {
+        batch.announce(SessionBegin{.number = session,
+                                    .source = source,
+                                    .reporterID = 42,
+                                    .serviceType = "media",
+                                    .application = std::move(application),
+                                    .time = 1'700'000'001.5});
+    }
+    void add(Origin origin, int number, const char* name = "a")
+    {
+        batch.add(1, origin, name, Dictionary{{"n", number}});
+    }
+    void keepBatch()
+    {
+        keeper().keep(batch, tally);
+        batch.clear();
+    }
+    std::vector<std::string> events()
+    {
+        return StoreReader(file()).texts(
+            "SELECT payload || ' ' || coalesce(session, '-') || ' ' || coalesce(source, '-') FROM events ORDER BY id");
+    }
+    std::vector<std::string> sources()
+    {
+        return StoreReader(file()).texts("SELECT id || ' ' || user || ' ' || process || ' ' || "
+                                         "coalesce(name, '-') || ' ' || began || ' ' || coalesce(ended, '-') "
+                                         "FROM sources ORDER BY id");
+    }
+    std::vector<std::string> sessions()
+    {
+        return StoreReader(file()).texts(
+            "SELECT id || ' ' || coalesce(source, '-') || ' ' || reporter || ' ' || coalesce(service, '-') || ' ' || "
+            "application || ' ' || began || ' ' || coalesce(ended, '-') FROM sessions ORDER BY id");
+    }
+
+    EventBatch batch;
+};
+
+TEST_F(OriginsTest, AnEventNamesItsSourceAndItsSession)
+{
+    begin(7);
+    beginSession(9, 7);
+    add({.source = 7, .session = 9}, 1);
+    add({.source = 7, .session = 0}, 2);
+    add({}, 3);
+    keepBatch();
+    EXPECT_THAT(events(), ElementsAre("{\"n\":1} 1 1", "{\"n\":2} - 1", "{\"n\":3} - -"));
+    EXPECT_THAT(sources(), ElementsAre("1 1000 77 player 1700000000.5 -"));
+    EXPECT_THAT(sessions(), ElementsAre("1 1 42 media org.example.a 1700000001.5 -"));
+    const std::string boot = StoreReader(file()).text("SELECT boot FROM sources");
+    EXPECT_EQ(boot + "\n", support::readFile("/proc/sys/kernel/random/boot_id"));
+}
+
+TEST_F(OriginsTest, WithoutAnEventThereIsNoRow)
+{
+    begin(7);
+    beginSession(9, 7);
+    keepBatch();
+    batch.announceSessionEnd({.number = 9, .time = 2});
+    batch.announceSourceEnd({.number = 7, .time = 2});
+    keepBatch();
+    keep({event(1)});
+    EXPECT_THAT(sources(), IsEmpty());
+    EXPECT_THAT(sessions(), IsEmpty());
+}
+
+TEST_F(OriginsTest, TheirEndsAreKeptAlsoWithoutAnotherEvent)
+{
+    begin(7);
+    beginSession(9, 7);
+    add({.source = 7, .session = 9}, 1);
+    keepBatch();
+    batch.announceSessionEnd({.number = 9, .time = 1'700'000'002});
+    batch.announceSourceEnd({.number = 7, .time = 1'700'000'003});
+    keepBatch();
+    EXPECT_THAT(sources(), ElementsAre("1 1000 77 player 1700000000.5 1700000003.0"));
+    EXPECT_THAT(sessions(), ElementsAre("1 1 42 media org.example.a 1700000001.5 1700000002.0"));
+}
+
+TEST_F(OriginsTest, AnEventThatComesAfterTheEndStillHasItsSource)
+{
+    begin(7, "");
+    keepBatch();
+    batch.announceSourceEnd({.number = 7, .time = 1'700'000'003});
+    keepBatch();
+    add({.source = 7, .session = 0}, 1, "com.quarn.kesto.kestoreportingclientuptime");
+    keepBatch();
+    EXPECT_THAT(events(), ElementsAre("{\"n\":1} - 1"));
+    EXPECT_THAT(sources(), ElementsAre("1 1000 77 - 1700000000.5 1700000003.0"));
+}
+
+TEST_F(OriginsTest, ASessionThatChangesIsWrittenAgain)
+{
+    begin(7);
+    beginSession(9, 7);
+    add({.source = 7, .session = 9}, 1);
+    keepBatch();
+    beginSession(9, 7, "org.example.b");
+    add({.source = 7, .session = 9}, 2);
+    keepBatch();
+    EXPECT_THAT(sessions(), ElementsAre("1 1 42 media org.example.b 1700000001.5 -"));
+    EXPECT_THAT(events(), ElementsAre("{\"n\":1} 1 1", "{\"n\":2} 1 1"));
+}
+
+TEST_F(OriginsTest, AMessageToAnothersSessionHasItsOwnSource)
+{
+    begin(7);
+    begin(8, "other");
+    beginSession(9, 7);
+    add({.source = 8, .session = 9}, 1);
+    keepBatch();
+    EXPECT_THAT(sources(), ElementsAre("1 1000 77 other 1700000000.5 -", "2 1000 77 player 1700000000.5 -"));
+    EXPECT_THAT(sessions(), ElementsAre("1 2 42 media org.example.a 1700000001.5 -"));
+    EXPECT_THAT(events(), ElementsAre("{\"n\":1} 1 1"));
+}
+
+TEST_F(OriginsTest, ANewDatabaseGetsThoseThatLive)
+{
+    begin(7);
+    beginSession(9, 7);
+    add({.source = 7, .session = 9}, 1);
+    keepBatch();
+    fs::remove(file());
+    add({.source = 7, .session = 9}, 2);
+    keepBatch();
+    EXPECT_THAT(events(), ElementsAre("{\"n\":2} 1 1"));
+    EXPECT_THAT(sources(), ElementsAre("1 1000 77 player 1700000000.5 -"));
+    EXPECT_THAT(sessions(), ElementsAre("1 1 42 media org.example.a 1700000001.5 -"));
+}
+
+TEST_F(OriginsTest, WhatATransactionThatFailedWouldHaveWrittenIsWrittenWithTheNext)
+{
+    keep({event(1)});
+    sqlite3* other = nullptr;
+    ASSERT_EQ(::sqlite3_open(file().c_str(), &other), SQLITE_OK);
+    ASSERT_EQ(::sqlite3_exec(other, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr), SQLITE_OK);
+    begin(7);
+    beginSession(9, 7);
+    add({.source = 7, .session = 9}, 1);
+    keepBatch();
+    EXPECT_EQ(lost(StoreError::Locked), 1U);
+    ASSERT_EQ(::sqlite3_exec(other, "ROLLBACK", nullptr, nullptr, nullptr), SQLITE_OK);
+    ::sqlite3_close(other);
+    add({.source = 7, .session = 9}, 2);
+    keepBatch();
+    EXPECT_THAT(events(), ElementsAre("{\"key\":1} - -", "{\"n\":2} 1 1"));
+    EXPECT_THAT(sources(), SizeIs(1));
+    EXPECT_THAT(sessions(), SizeIs(1));
+}
+
+TEST_F(OriginsTest, AnotherRunOfTheServiceHasRowsOfItsOwn)
+{
+    for (int run = 0; run < 2; ++run) {
+        begin(7);
+        add({.source = 7, .session = 0}, run);
+        keepBatch();
+        closeWriter();
+    }
+    EXPECT_THAT(events(), ElementsAre("{\"n\":0} - 1", "{\"n\":1} - 2"));
+    EXPECT_THAT(sources(), SizeIs(2));
+}
+
+TEST_F(OriginsTest, ThoseThatEndedLongAgoAreForgotten)
+{
+    begin(7);
+    keepBatch();
+    batch.announceSourceEnd({.number = 7, .time = 2});
+    for (std::uint64_t other = 100; other < 1124; ++other) {
+        begin(other);
+        batch.announceSourceEnd({.number = other, .time = 2});
+    }
+    keepBatch();
+    add({.source = 7, .session = 0}, 1);
+    add({.source = 1123, .session = 0}, 2);
+    keepBatch();
+    EXPECT_THAT(events(), ElementsAre("{\"n\":1} - -", "{\"n\":2} - 1"));
+}
+
 // --- Files that are not a database, damaged or newer
 
 TEST_F(SqliteKeeperTest, AFileThatIsNoDatabaseIsSetAside)
@@ -269,7 +567,8 @@ TEST_F(SqliteKeeperTest, ADatabaseOfSomethingElseIsSetAside)
 {
     for (const char* sql :
          {"CREATE TABLE other(a)", "CREATE TABLE events(a); PRAGMA user_version = 1", "PRAGMA user_version = 1",
-          "PRAGMA user_version = -3", "CREATE TABLE events(id, time, name, payload)"}) {
+          "PRAGMA user_version = -3", "CREATE TABLE events(id, time, name, payload)", "PRAGMA user_version = 2",
+          "CREATE TABLE store(a); PRAGMA user_version = 2"}) {
         closeWriter();
         fs::remove(file());
         sqlite3* connection = nullptr;
@@ -291,8 +590,8 @@ TEST_F(SqliteKeeperTest, ADatabaseThatIsDamagedWhileItIsUsedIsSetAside)
         // All pages except the first are damaged.
         std::fstream damaged(file(), std::ios::in | std::ios::out | std::ios::binary);
         const auto size = static_cast<std::streamsize>(fs::file_size(file()));
-        damaged.seekp(4096);
-        const std::string rubbish(static_cast<std::size_t>(size - 4096), '\x5a');
+        damaged.seekp(8192);
+        const std::string rubbish(static_cast<std::size_t>(size - 8192), '\x5a');
         damaged.write(rubbish.data(), static_cast<std::streamsize>(rubbish.size()));
     }
     keep({event(1, "after")});
@@ -339,7 +638,7 @@ TEST_F(SqliteKeeperTest, ANewerDatabaseIsSetAsideUntouched)
         sqlite3* connection = nullptr;
         ASSERT_EQ(::sqlite3_open(file().c_str(), &connection), SQLITE_OK);
         ASSERT_EQ(
-            ::sqlite3_exec(connection, "CREATE TABLE more(a); PRAGMA user_version = 2", nullptr, nullptr, nullptr),
+            ::sqlite3_exec(connection, "CREATE TABLE more(a); PRAGMA user_version = 3", nullptr, nullptr, nullptr),
             SQLITE_OK);
         ::sqlite3_close(connection);
     }
@@ -348,7 +647,7 @@ TEST_F(SqliteKeeperTest, ANewerDatabaseIsSetAsideUntouched)
     const auto aside = filesNamed(".newer-");
     ASSERT_THAT(aside, Not(IsEmpty()));
     StoreReader newer(directory / aside.front());
-    EXPECT_EQ(newer.number("PRAGMA user_version"), 2);
+    EXPECT_EQ(newer.number("PRAGMA user_version"), 3);
     EXPECT_EQ(newer.eventCount(), 1);
     EXPECT_THAT(log.take(),
                 ElementsAre(Field(&LogLine::message, HasSubstr("was made by a later version of the service"))));

@@ -22,8 +22,8 @@ public:
     StoreReader(const StoreReader&) = delete;
     StoreReader& operator=(const StoreReader&) = delete;
 
-    // The first column of every row.
-    std::vector<std::string> texts(const std::string& sql)
+    // One column of every row.
+    std::vector<std::string> texts(const std::string& sql, int column = 0)
     {
         sqlite3_stmt* statement = nullptr;
         if (::sqlite3_prepare_v2(connection_, sql.c_str(), -1, &statement, nullptr) != SQLITE_OK)
@@ -31,7 +31,7 @@ public:
         std::vector<std::string> rows;
         int step = 0;
         while ((step = ::sqlite3_step(statement)) == SQLITE_ROW) {
-            const auto* text = reinterpret_cast<const char*>(::sqlite3_column_text(statement, 0));
+            const auto* text = reinterpret_cast<const char*>(::sqlite3_column_text(statement, column));
             rows.emplace_back(text == nullptr ? "NULL" : text);
         }
         ::sqlite3_finalize(statement);

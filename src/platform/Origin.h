@@ -1,0 +1,72 @@
+// Who is behind an event: the connection that it came over, its source, and the session that it belongs to.
+//
+// Events carry numbers, because a name for each event would cost as much as the event. What the numbers stand for is
+// announced once, in the batch of the first event that has them, so that it is kept with that event or not at all.
+#pragma once
+
+#include <atomic>
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace platform {
+
+// The service gives out the numbers; each is unique for as long as the service runs. 0: none.
+struct Origin {
+    std::uint64_t source = 0;
+    std::uint64_t session = 0;
+
+    friend bool operator==(const Origin&, const Origin&) = default;
+};
+
+// The next number of a source or of a session. Any thread.
+[[nodiscard]] inline std::uint64_t nextOriginNumber() noexcept
+{
+    static std::atomic<std::uint64_t> last = 0;
+    return ++last;
+}
+
+// A connection, as the kernel describes its other end.
+struct SourceBegin {
+    std::uint64_t number = 0;
+    std::uint32_t userIdentifier = 0;
+    std::int32_t processIdentifier = 0;
+    std::string processName = {}; // empty if it is not known
+    double time = 0; // seconds since 1970 UTC, as below
+
+    friend bool operator==(const SourceBegin&, const SourceBegin&) = default;
+};
+
+struct SessionBegin {
+    std::uint64_t number = 0;
+    std::uint64_t source = 0; // of the session's owner
+    std::int64_t reporterID = 0;
+    std::string serviceType = {}; // its name; empty until one is set
+    std::string application = {};
+    double time = 0;
+
+    friend bool operator==(const SessionBegin&, const SessionBegin&) = default;
+};
+
+struct OriginEnd {
+    std::uint64_t number = 0;
+    double time = 0;
+
+    friend bool operator==(const OriginEnd&, const OriginEnd&) = default;
+};
+
+// What one batch announces. The begins count before its events, the ends after them.
+struct OriginAnnouncements {
+    std::vector<SourceBegin> sources;
+    std::vector<SessionBegin> sessions;
+    std::vector<OriginEnd> sourceEnds;
+    std::vector<OriginEnd> sessionEnds;
+
+    [[nodiscard]] bool empty() const noexcept
+    {
+        return sources.empty() && sessions.empty() && sourceEnds.empty() && sessionEnds.empty();
+    }
+};
+
+} // namespace platform

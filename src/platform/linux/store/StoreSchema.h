@@ -1,0 +1,58 @@
+// The tables of the store, and the one row that counts. docs/store.md describes them for those who query them.
+#pragma once
+
+#include "platform/linux/store/SqliteConnection.h"
+
+#include <cstdint>
+#include <string>
+
+namespace platform {
+
+// The row of the table `store`, written with every transaction.
+struct StoreCounts {
+    // The next ID of an event, of a source, of a session. IDs are never used again.
+    std::int64_t nextEvent = 1;
+    std::int64_t nextSource = 1;
+    std::int64_t nextSession = 1;
+    // How many events were ever kept and removed: the store holds the difference.
+    std::int64_t kept = 0;
+    std::int64_t removed = 0;
+
+    [[nodiscard]] std::uint64_t events() const noexcept { return static_cast<std::uint64_t>(kept - removed); }
+    friend bool operator==(const StoreCounts&, const StoreCounts&) = default;
+};
+
+class StoreSchema {
+public:
+    static constexpr std::int64_t edition = 2;
+
+    // Makes the tables in an empty file. A file of the first edition gets them beside its events, at once, however many
+    // it has: `FirstEdition` moves them later. Newer: a later edition; Corrupt: not a database of events.
+    [[nodiscard]] static StoreExpected<> make(SqliteConnection& connection);
+    // Ends the time of the first edition's table, which must be empty.
+    [[nodiscard]] static StoreExpected<> dropFirstEdition(SqliteConnection& connection);
+};
+
+// One thread at a time.
+class StoreCountsRow {
+public:
+    [[nodiscard]] static StoreExpected<StoreCountsRow> open(SqliteConnection& connection);
+
+    [[nodiscard]] StoreCounts& counts() noexcept { return counts_; }
+    // Random, and the same for as long as the database exists.
+    [[nodiscard]] const std::string& epoch() const noexcept { return epoch_; }
+    // Writes the counts with the running transaction, if they changed.
+    [[nodiscard]] StoreExpected<> write();
+    // What the database holds.
+    [[nodiscard]] const StoreCounts& committed() const noexcept { return committed_; }
+    void noteCommit() noexcept { committed_ = counts_; }
+    void rolledBack() noexcept { counts_ = committed_; }
+
+private:
+    SqliteStatement update_;
+    StoreCounts counts_;
+    StoreCounts committed_;
+    std::string epoch_;
+};
+
+} // namespace platform
