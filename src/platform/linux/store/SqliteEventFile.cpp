@@ -24,13 +24,13 @@ template <typename Work> SqliteEventFile::Expected<> SqliteEventFile::inTransact
 
 // --- Opening
 
-SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>> SqliteEventFile::open(const std::filesystem::path& path,
-                                                                                  KnownOrigins& origins)
+SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>>
+SqliteEventFile::open(const std::filesystem::path& path, const Clock& clock, KnownOrigins& origins)
 {
-    std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path, origins));
+    std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path, clock, origins));
     for (const auto step :
          {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::makeSchema,
-          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::recogniseOrigins})
+          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::beginRun})
         if (const auto done = (*database.*step)(); !done)
             return std::unexpected(done.error());
     return database;
@@ -82,7 +82,7 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
     const auto corruptIfOther = [](StoreError error) {
         return std::unexpected(error == StoreError::Other ? StoreError::Corrupt : error);
     };
-    auto counts = StoreCountsRow::open(*connection_);
+    auto counts = StoreCountsRow::open(*connection_, clock_.secondsSince1970());
     if (!counts)
         return corruptIfOther(counts.error());
     counts_ = std::move(*counts);
@@ -94,6 +94,10 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
     if (!originRows)
         return corruptIfOther(originRows.error());
     originRows_ = std::move(*originRows);
+    auto ages = EventAges::open(*connection_);
+    if (!ages)
+        return corruptIfOther(ages.error());
+    ages_ = std::move(*ages);
     auto firstEdition = FirstEdition::open(*connection_);
     if (!firstEdition)
         return corruptIfOther(firstEdition.error());
@@ -106,7 +110,7 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
         {&commit_, "COMMIT"},
         {&insert_,
          "INSERT INTO messages(id, time, kind, session, source, happened, payload) VALUES (?, ?, ?, ?, ?, ?, ?)"},
-        {&selectBefore_, fmt::format("{} WHERE m.kind IN (SELECT id FROM kinds) AND m.time < ?2 LIMIT ?1", columns)},
+        {&selectBelow_, fmt::format("{} WHERE m.id < ?2 ORDER BY m.id LIMIT ?1", columns)},
         {&selectOldest_, fmt::format("{} ORDER BY m.id LIMIT ?1", columns)},
         {&delete_, "DELETE FROM messages WHERE id = ?"}};
     for (const auto& [statement, sql] : wanted) {
@@ -118,15 +122,23 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
     return {};
 }
 
-// A database that this run has not seen yet has no rows of its sources and sessions.
-SqliteEventFile::Expected<> SqliteEventFile::recogniseOrigins()
+// A database that this run has not seen yet has no rows of its sources and sessions. Whatever it holds was kept before.
+SqliteEventFile::Expected<> SqliteEventFile::beginRun()
 {
-    if (origins_.epoch == counts_.epoch())
-        return {};
-    origins_.epoch = counts_.epoch();
-    origins_.sources.forgetRows();
-    origins_.sessions.forgetRows();
-    return inTransaction([this] { return originRows_.closeEarlierRun(counts_.counts()); });
+    StoreCounts& counts = counts_.counts();
+    ageClock_.emplace(clock_, counts.clock, counts.nextEvent);
+    committedAgeClock_ = ageClock_;
+    const bool isKnown = origins_.epoch == counts_.epoch();
+    if (!isKnown) {
+        origins_.epoch = counts_.epoch();
+        origins_.sources.forgetRows();
+        origins_.sessions.forgetRows();
+    }
+    return inTransaction([&]() -> Expected<> {
+        if (const auto done = ages_.markNow(counts.nextEvent, counts.clock.time); !done)
+            return done;
+        return isKnown ? Expected<>() : originRows_.closeEarlierRun(counts);
+    });
 }
 
 bool SqliteEventFile::wasReplaced() const
@@ -183,13 +195,29 @@ SqliteEventFile::Expected<> SqliteEventFile::commit()
 {
     if (const auto done = originRows_.writeChanges(origins_, counts_.counts()); !done)
         return done;
+    if (const auto done = keepTime(); !done)
+        return done;
     if (const auto done = counts_.write(); !done)
         return done;
     if (const auto done = commit_.run(); !done)
         return done;
     counts_.noteCommit();
     origins_.committed();
+    ages_.committed();
+    committedAgeClock_ = ageClock_;
     return {};
+}
+
+// The events before this transaction were kept by the time of the last one.
+SqliteEventFile::Expected<> SqliteEventFile::keepTime()
+{
+    const StoreCounts& before = counts_.committed();
+    const auto correction = ageClock_->advance();
+    counts_.counts().clock = ageClock_->state();
+    if (counts_.counts().nextEvent != before.nextEvent)
+        if (const auto done = ages_.mark(before.nextEvent, before.clock.time, ageClock_->state().time); !done)
+            return done;
+    return correction ? ages_.apply(*correction) : Expected<>();
 }
 
 void SqliteEventFile::rollBack()
@@ -198,6 +226,8 @@ void SqliteEventFile::rollBack()
     counts_.rolledBack();
     kinds_.rolledBack();
     origins_.rolledBack();
+    ages_.rolledBack();
+    ageClock_ = committedAgeClock_;
 }
 
 // --- The first edition
@@ -212,11 +242,25 @@ SqliteEventFile::Expected<> SqliteEventFile::moveFirstEdition()
         return StoreSchema::dropFirstEdition(*connection_);
     }
     return inTransaction([&]() -> Expected<> {
-        for (const auto& [id, time, happened, name, secondName, payload] : *messages)
+        for (const auto& [id, time, happened, name, secondName, payload] : *messages) {
+            if (const auto done = markFirstEdition(id, time); !done)
+                return done;
             if (const auto done = insert(id, {time, happened, {}, name, secondName, payload}); !done)
                 return done;
+        }
         return firstEdition_->remove(*messages, counts_.counts());
     });
+}
+
+// The first edition knew only when the service sent an event, by a clock that may have been wrong: what lies in the
+// future or before an earlier event says nothing.
+SqliteEventFile::Expected<> SqliteEventFile::markFirstEdition(std::int64_t id, double time)
+{
+    const double wall = clock_.secondsSince1970();
+    if (time > wall || time < latestOfFirstEdition_ + EventAges::secondsBetweenMarks)
+        return {};
+    latestOfFirstEdition_ = time;
+    return ages_.markEarlier(id, ageClock_->state().time - (wall - time));
 }
 
 // --- Limits
@@ -242,11 +286,24 @@ SqliteEventFile::Expected<SqliteEventFile::Size> SqliteEventFile::size()
                 .freeBytes = static_cast<std::uint64_t>(*free) * pageSize_};
 }
 
-SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteBefore(double time, std::uint64_t most)
+SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOlderThan(double seconds, std::uint64_t most)
 {
-    selectBefore_.bind(1, most);
-    selectBefore_.bind(2, time);
-    return deleteSelected(selectBefore_, UINT64_MAX);
+    AgeClock now = *ageClock_;
+    if (now.advance()) // events are older than it seemed
+        if (const auto done = inTransaction([]() -> Expected<> { return {}; }); !done)
+            return std::unexpected(done.error());
+    const double until = now.state().time - seconds;
+    const StoreCounts& counts = counts_.committed();
+    const auto below = counts.clock.time <= until ? Expected<std::int64_t>(counts.nextEvent) : ages_.keptBy(until);
+    if (!below)
+        return std::unexpected(below.error());
+    selectBelow_.bind(1, most);
+    selectBelow_.bind(2, *below);
+    const auto deleted = deleteSelected(selectBelow_, UINT64_MAX);
+    if (deleted && *deleted == 0 && *below != 0)
+        if (const auto done = ages_.forget(*below); !done)
+            return std::unexpected(done.error());
+    return deleted;
 }
 
 SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOldest(std::uint64_t bytes, std::uint64_t most)

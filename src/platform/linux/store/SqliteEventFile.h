@@ -7,7 +7,9 @@
 
 #include "platform/EventBatch.h"
 #include "platform/linux/files/FileDescriptor.h"
+#include "platform/linux/store/AgeClock.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
+#include "platform/linux/store/EventAges.h"
 #include "platform/linux/store/EventKinds.h"
 #include "platform/linux/store/FirstEdition.h"
 #include "platform/linux/store/OriginRows.h"
@@ -31,7 +33,7 @@ public:
     // Opens the file, or makes it. A file that is corrupt or of a later edition stays as it is. The origins, which must
     // outlive the file, are those of this run.
     [[nodiscard]] static Expected<std::unique_ptr<SqliteEventFile>> open(const std::filesystem::path& path,
-                                                                         KnownOrigins& origins);
+                                                                         const Clock& clock, KnownOrigins& origins);
     SqliteEventFile(const SqliteEventFile&) = delete;
     SqliteEventFile& operator=(const SqliteEventFile&) = delete;
     ~SqliteEventFile();
@@ -69,8 +71,9 @@ public:
         std::uint64_t freeBytes = 0; // room in the file that no event uses
     };
     [[nodiscard]] Expected<Size> size();
-    // Deletes messages that were sent before that time, at most `most`. Returns how many events they were.
-    [[nodiscard]] Expected<std::uint64_t> deleteBefore(double time, std::uint64_t most);
+    // Deletes messages that were kept so many seconds ago or earlier, at most `most`. Returns how many events they
+    // were.
+    [[nodiscard]] Expected<std::uint64_t> deleteOlderThan(double seconds, std::uint64_t most);
     // Deletes the oldest messages until they have freed so many bytes, but at most `most` of them. Returns how many
     // events they were.
     [[nodiscard]] Expected<std::uint64_t> deleteOldest(std::uint64_t bytes, std::uint64_t most);
@@ -78,18 +81,26 @@ public:
     [[nodiscard]] Expected<> shrink(std::uint64_t mostBytes);
 
 private:
-    SqliteEventFile(std::filesystem::path path, KnownOrigins& origins) : path_(std::move(path)), origins_(origins) { }
+    SqliteEventFile(std::filesystem::path path, const Clock& clock, KnownOrigins& origins)
+        : path_(std::move(path)),
+          clock_(clock),
+          origins_(origins)
+    {
+    }
     [[nodiscard]] Expected<> lockDirectory();
     [[nodiscard]] Expected<> connect();
     [[nodiscard]] Expected<> makeSchema();
     [[nodiscard]] Expected<> configure();
     [[nodiscard]] Expected<> prepareStatements();
-    [[nodiscard]] Expected<> recogniseOrigins();
+    [[nodiscard]] Expected<> beginRun();
+    [[nodiscard]] Expected<> keepTime();
+    [[nodiscard]] Expected<> markFirstEdition(std::int64_t id, double time);
     [[nodiscard]] Expected<> insert(std::int64_t id, const EventRow& row);
     template <typename Work> [[nodiscard]] Expected<> inTransaction(Work work);
     [[nodiscard]] Expected<std::uint64_t> deleteSelected(const SqliteStatement& select, std::uint64_t bytes);
 
     const std::filesystem::path path_;
+    const Clock& clock_;
     KnownOrigins& origins_;
     FileDescriptor directoryLock_;
     std::unique_ptr<SqliteConnection> connection_; // outlives the statements below
@@ -99,11 +110,15 @@ private:
     StoreCountsRow counts_;
     EventKinds kinds_;
     OriginRows originRows_;
+    EventAges ages_;
+    std::optional<AgeClock> ageClock_;
+    std::optional<AgeClock> committedAgeClock_;
+    double latestOfFirstEdition_ = 0; // the time of the latest event of the first edition that was moved
     std::optional<FirstEdition> firstEdition_;
     SqliteStatement begin_;
     SqliteStatement commit_;
     SqliteStatement insert_;
-    SqliteStatement selectBefore_;
+    SqliteStatement selectBelow_;
     SqliteStatement selectOldest_;
     SqliteStatement delete_;
 };

@@ -97,10 +97,10 @@ SqliteKeeper::Expected<> SqliteKeeper::ensureOpen()
 
 SqliteKeeper::Expected<> SqliteKeeper::openAnew()
 {
-    auto opened = SqliteEventFile::open(path_, origins_);
+    auto opened = SqliteEventFile::open(path_, clock_, origins_);
     if (!opened && (opened.error() == StoreError::Corrupt || opened.error() == StoreError::Newer)
         && setAside(opened.error()))
-        opened = SqliteEventFile::open(path_, origins_);
+        opened = SqliteEventFile::open(path_, clock_, origins_);
     if (!opened)
         return std::unexpected(opened.error());
     database_ = std::move(*opened);
@@ -320,10 +320,10 @@ bool SqliteKeeper::makeRoom(ledger::Tally& tally)
 // False if nothing is left to do.
 SqliteKeeper::Expected<bool> SqliteKeeper::makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally)
 {
-    const double tooOld = clock_.secondsSince1970() - configuration_.maximumAgeDays * secondsADay;
     const bool isTooLarge = size.usedBytes > maximumBytes();
-    const auto deleted = isTooLarge ? database_->deleteOldest(size.usedBytes - maximumBytes(), eventsDeletedAtOnce)
-                                    : database_->deleteBefore(tooOld, eventsDeletedAtOnce);
+    const auto deleted = isTooLarge
+        ? database_->deleteOldest(size.usedBytes - maximumBytes(), eventsDeletedAtOnce)
+        : database_->deleteOlderThan(configuration_.maximumAgeDays * secondsADay, eventsDeletedAtOnce);
     if (!deleted)
         return std::unexpected(deleted.error());
     tally.add(isTooLarge ? ledger::Counter::RemovedForSize : ledger::Counter::RemovedForAge, *deleted);

@@ -45,9 +45,11 @@ constexpr std::string_view tables =
     "CREATE TABLE store("
     "row INTEGER PRIMARY KEY CHECK (row = 1), epoch TEXT NOT NULL,"
     " next_event INTEGER NOT NULL, next_source INTEGER NOT NULL, next_session INTEGER NOT NULL,"
-    " kept INTEGER NOT NULL, removed INTEGER NOT NULL"
+    " kept INTEGER NOT NULL, removed INTEGER NOT NULL,"
+    " age_time REAL NOT NULL, wall_time REAL, away REAL NOT NULL, trial REAL NOT NULL, away_below INTEGER NOT NULL"
     ") STRICT;"
-    "INSERT INTO store VALUES (1, lower(hex(randomblob(16))), 1, 1, 1, 0, 0);";
+    "INSERT INTO store VALUES (1, lower(hex(randomblob(16))), 1, 1, 1, 0, 0, 0, NULL, 0, 0, 0);"
+    "CREATE TABLE ages(below INTEGER PRIMARY KEY, kept REAL NOT NULL) STRICT;";
 
 constexpr std::string_view view =
     "CREATE VIEW events(id, time, name, payload, session, source, happened) AS "
@@ -113,15 +115,17 @@ StoreExpected<> StoreSchema::dropFirstEdition(SqliteConnection& connection)
         fmt::format("BEGIN IMMEDIATE; DROP VIEW events; DROP TABLE first_edition; {}; COMMIT", view).c_str());
 }
 
-StoreExpected<StoreCountsRow> StoreCountsRow::open(SqliteConnection& connection)
+StoreExpected<StoreCountsRow> StoreCountsRow::open(SqliteConnection& connection, double wall)
 {
     StoreCountsRow row;
-    const auto select =
-        connection.prepare("SELECT next_event, next_source, next_session, kept, removed, epoch FROM store");
-    auto update = connection.prepare("UPDATE store SET next_event = ?, next_source = ?, next_session = ?, kept = ?,"
-                                     " removed = ? WHERE row = 1");
+    const auto select = connection.prepare("SELECT next_event, next_source, next_session, kept, removed, epoch,"
+                                           " age_time, coalesce(wall_time, ?), away, trial, away_below FROM store");
+    auto update = connection.prepare(
+        "UPDATE store SET next_event = ?, next_source = ?, next_session = ?, kept = ?,"
+        " removed = ?, age_time = ?, wall_time = ?, away = ?, trial = ?, away_below = ? WHERE row = 1");
     if (!select || !update)
         return std::unexpected(select ? update.error() : select.error());
+    select->bind(1, wall);
     const auto isThere = select->step();
     if (!isThere)
         return std::unexpected(isThere.error());
@@ -131,7 +135,12 @@ StoreExpected<StoreCountsRow> StoreCountsRow::open(SqliteConnection& connection)
                    .nextSource = select->integer(1),
                    .nextSession = select->integer(2),
                    .kept = select->integer(3),
-                   .removed = select->integer(4)};
+                   .removed = select->integer(4),
+                   .clock = {.time = select->real(6),
+                             .wall = select->real(7),
+                             .away = select->real(8),
+                             .trial = select->real(9),
+                             .awayBelow = select->integer(10)}};
     row.committed_ = row.counts_;
     row.epoch_ = select->text(5);
     row.update_ = std::move(*update);
@@ -142,10 +151,13 @@ StoreExpected<> StoreCountsRow::write()
 {
     if (counts_ == committed_)
         return {};
-    const auto& [nextEvent, nextSource, nextSession, kept, removed] = counts_;
+    const auto& [nextEvent, nextSource, nextSession, kept, removed, clock] = counts_;
     int parameter = 0;
     for (const std::int64_t count : {nextEvent, nextSource, nextSession, kept, removed})
         update_.bind(++parameter, count);
+    for (const double seconds : {clock.time, clock.wall, clock.away, clock.trial})
+        update_.bind(++parameter, seconds);
+    update_.bind(++parameter, clock.awayBelow);
     return update_.run();
 }
 

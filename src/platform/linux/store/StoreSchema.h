@@ -1,6 +1,7 @@
 // The tables of the store, and the one row that counts. docs/store.md describes them for those who query them.
 #pragma once
 
+#include "platform/linux/store/AgeClock.h"
 #include "platform/linux/store/SqliteConnection.h"
 
 #include <cstdint>
@@ -17,6 +18,7 @@ struct StoreCounts {
     // How many events were ever kept and removed: the store holds the difference.
     std::int64_t kept = 0;
     std::int64_t removed = 0;
+    AgeClockState clock;
 
     [[nodiscard]] std::uint64_t events() const noexcept { return static_cast<std::uint64_t>(kept - removed); }
     friend bool operator==(const StoreCounts&, const StoreCounts&) = default;
@@ -36,7 +38,8 @@ public:
 // One thread at a time.
 class StoreCountsRow {
 public:
-    [[nodiscard]] static StoreExpected<StoreCountsRow> open(SqliteConnection& connection);
+    // `wall` is the time on the wall, for a database that has none yet.
+    [[nodiscard]] static StoreExpected<StoreCountsRow> open(SqliteConnection& connection, double wall);
 
     [[nodiscard]] StoreCounts& counts() noexcept { return counts_; }
     // Random, and the same for as long as the database exists.

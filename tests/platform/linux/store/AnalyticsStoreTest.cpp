@@ -552,7 +552,7 @@ TEST_F(AnalyticsStoreTest, NewBoundsAreAppliedWithoutAnotherEvent)
     clock.set(100 * 86400);
     send(1);
     store().flush();
-    clock.set(150 * 86400);
+    clock.advance(50 * 86400);
     support::writeFile(temporary.path() / "analytics.toml", "maximum_age_days = 10");
     EXPECT_TRUE(becomesTrue([&] { return storedEvents() == 0; }));
 }
