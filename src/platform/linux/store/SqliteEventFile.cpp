@@ -94,6 +94,10 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
     if (!originRows)
         return corruptIfOther(originRows.error());
     originRows_ = std::move(*originRows);
+    auto holders = EventHolders::open(*connection_);
+    if (!holders)
+        return corruptIfOther(holders.error());
+    holders_ = std::move(*holders);
     auto ages = EventAges::open(*connection_);
     if (!ages)
         return corruptIfOther(ages.error());
@@ -103,15 +107,17 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
         return corruptIfOther(firstEdition.error());
     firstEdition_ = std::move(*firstEdition);
 
-    constexpr std::string_view columns = "SELECT m.id, 1 + (k.second_name IS NOT NULL), length(CAST(m.payload AS BLOB))"
-                                         " FROM messages m JOIN kinds k ON k.id = m.kind";
-    const std::initializer_list<std::pair<SqliteStatement*, std::string>> wanted = {
+    const std::initializer_list<std::pair<SqliteStatement*, std::string_view>> wanted = {
         {&begin_, "BEGIN IMMEDIATE"},
         {&commit_, "COMMIT"},
         {&insert_,
-         "INSERT INTO messages(id, time, kind, session, source, happened, payload) VALUES (?, ?, ?, ?, ?, ?, ?)"},
-        {&selectBelow_, fmt::format("{} WHERE m.id < ?2 ORDER BY m.id LIMIT ?1", columns)},
-        {&selectOldest_, fmt::format("{} ORDER BY m.id LIMIT ?1", columns)},
+         "INSERT INTO messages(id, time, kind, session, source, happened, holder, payload)"
+         " VALUES (?, ?, ?, ?, ?, ?, ?, ?)"},
+        {&selectBelow_, "SELECT id FROM messages WHERE id < ? ORDER BY id LIMIT ?"},
+        {&selectFrom_, "SELECT id, holder FROM messages WHERE id >= ? ORDER BY id LIMIT ?"},
+        {&selectOne_,
+         "SELECT 1 + (k.second_name IS NOT NULL), length(CAST(m.payload AS BLOB)), m.holder"
+         " FROM messages m JOIN kinds k ON k.id = m.kind WHERE m.id = ?"},
         {&delete_, "DELETE FROM messages WHERE id = ?"}};
     for (const auto& [statement, sql] : wanted) {
         auto prepared = connection_->prepare(sql);
@@ -157,6 +163,7 @@ SqliteEventFile::Expected<> SqliteEventFile::setSynchronization(StoreSynchroniza
 
 SqliteEventFile::Expected<> SqliteEventFile::begin()
 {
+    lastHolder_.reset();
     return begin_.run();
 }
 
@@ -164,8 +171,12 @@ SqliteEventFile::Expected<> SqliteEventFile::insert(std::span<const EventRow> ro
 {
     StoreCounts& counts = counts_.counts();
     for (const EventRow& row : rows) {
-        if (const auto done = insert(counts.nextEvent, row); !done)
+        const auto holder = holderOf(row.origin);
+        if (!holder)
+            return std::unexpected(holder.error());
+        if (const auto done = insert(counts.nextEvent, row, *holder); !done)
             return done;
+        holders_.add(*holder, row.payload.size());
         const auto events = static_cast<std::int64_t>(row.events());
         counts.nextEvent += events;
         counts.kept += events;
@@ -173,7 +184,25 @@ SqliteEventFile::Expected<> SqliteEventFile::insert(std::span<const EventRow> ro
     return {};
 }
 
-SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const EventRow& row)
+// Neighbours mostly have the same origin.
+SqliteEventFile::Expected<std::int64_t> SqliteEventFile::holderOf(const Origin& origin)
+{
+    if (lastHolder_ && lastHolder_->first == origin)
+        return lastHolder_->second;
+    EventHolder holder;
+    if (const auto* source = origins_.sources.find(origin.source)) {
+        holder.user = source->begin.userIdentifier;
+        holder.process = source->begin.processName;
+        if (const auto* session = origins_.sessions.find(origin.session))
+            holder.application = session->begin.application;
+    }
+    const auto id = holders_.idOf(std::move(holder), counts_.counts().nextEvent);
+    if (id)
+        lastHolder_ = {origin, *id};
+    return id;
+}
+
+SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const EventRow& row, std::int64_t holder)
 {
     const auto kind = kinds_.idOf(row.name, row.secondName);
     if (!kind)
@@ -187,13 +216,16 @@ SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const Event
     insert_.bind(4, rows->session);
     insert_.bind(5, rows->source);
     insert_.bind(6, row.happened);
-    insert_.bind(7, row.payload); // every payload is far shorter than SQLite's limit
+    insert_.bind(7, holder);
+    insert_.bind(8, row.payload); // every payload is far shorter than SQLite's limit
     return insert_.run();
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::commit()
 {
     if (const auto done = originRows_.writeChanges(origins_, counts_.counts()); !done)
+        return done;
+    if (const auto done = holders_.writeChanges(); !done)
         return done;
     if (const auto done = keepTime(); !done)
         return done;
@@ -203,6 +235,7 @@ SqliteEventFile::Expected<> SqliteEventFile::commit()
         return done;
     counts_.noteCommit();
     origins_.committed();
+    holders_.committed();
     ages_.committed();
     committedAgeClock_ = ageClock_;
     return {};
@@ -226,6 +259,7 @@ void SqliteEventFile::rollBack()
     counts_.rolledBack();
     kinds_.rolledBack();
     origins_.rolledBack();
+    holders_.rolledBack();
     ages_.rolledBack();
     ageClock_ = committedAgeClock_;
 }
@@ -242,11 +276,15 @@ SqliteEventFile::Expected<> SqliteEventFile::moveFirstEdition()
         return StoreSchema::dropFirstEdition(*connection_);
     }
     return inTransaction([&]() -> Expected<> {
+        const auto holder = holderOf({});
+        if (!holder)
+            return std::unexpected(holder.error());
         for (const auto& [id, time, happened, name, secondName, payload] : *messages) {
             if (const auto done = markFirstEdition(id, time); !done)
                 return done;
-            if (const auto done = insert(id, {time, happened, {}, name, secondName, payload}); !done)
+            if (const auto done = insert(id, {time, happened, {}, name, secondName, payload}, *holder); !done)
                 return done;
+            holders_.add(*holder, payload.size(), id);
         }
         return firstEdition_->remove(*messages, counts_.counts());
     });
@@ -297,51 +335,101 @@ SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOlderThan(double
     const auto below = counts.clock.time <= until ? Expected<std::int64_t>(counts.nextEvent) : ages_.keptBy(until);
     if (!below)
         return std::unexpected(below.error());
-    selectBelow_.bind(1, most);
-    selectBelow_.bind(2, *below);
-    const auto deleted = deleteSelected(selectBelow_, UINT64_MAX);
-    if (deleted && *deleted == 0 && *below != 0)
-        if (const auto done = ages_.forget(*below); !done)
-            return std::unexpected(done.error());
-    return deleted;
-}
-
-SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOldest(std::uint64_t bytes, std::uint64_t most)
-{
-    selectOldest_.bind(1, most);
-    return deleteSelected(selectOldest_, bytes);
-}
-
-SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteSelected(const SqliteStatement& select,
-                                                                         std::uint64_t bytes)
-{
-    std::vector<std::int64_t> ids;
-    std::int64_t events = 0;
-    for (std::uint64_t counted = 0; counted < bytes;) {
-        const auto row = select.step();
+    std::vector<Doomed> doomed;
+    selectBelow_.bind(1, *below);
+    selectBelow_.bind(2, most);
+    while (true) {
+        const auto row = selectBelow_.step();
         if (!row)
             return std::unexpected(row.error());
         if (!*row)
             break;
-        ids.push_back(select.integer(0));
-        events += select.integer(1);
-        counted += static_cast<std::uint64_t>(select.integer(2));
+        const auto message = look(selectBelow_.integer(0));
+        if (!message)
+            return std::unexpected(message.error());
+        doomed.push_back(*message);
     }
-    select.reset();
-    if (ids.empty())
+    if (doomed.empty()) {
+        if (const auto done = ages_.forget(*below); *below != 0 && !done)
+            return std::unexpected(done.error());
         return 0;
-    const auto done = inTransaction([&]() -> Expected<> {
-        for (const std::int64_t id : ids) {
-            delete_.bind(1, id);
-            if (const auto deleted = delete_.run(); !deleted)
-                return deleted;
-        }
-        counts_.counts().removed += events;
-        return {};
-    });
-    if (!done)
+    }
+    if (const auto done = remove(doomed); !done)
         return std::unexpected(done.error());
+    return eventsOf(doomed);
+}
+
+SqliteEventFile::Expected<SqliteEventFile::Removal> SqliteEventFile::deleteOfLargestHolder(std::uint64_t bytes,
+                                                                                           std::uint64_t most)
+{
+    const auto largest = holders_.largest();
+    if (!largest)
+        return Removal{.events = 0, .holder = {}, .isOnlyHolder = true, .isDone = true};
+    std::vector<Doomed> doomed;
+    std::uint64_t counted = 0;
+    std::uint64_t lookedAt = 0;
+    std::int64_t next = largest->oldest;
+    selectFrom_.bind(1, largest->oldest);
+    selectFrom_.bind(2, mostLookedAt);
+    while (doomed.size() < most && counted < bytes) {
+        const auto row = selectFrom_.step();
+        if (!row)
+            return std::unexpected(row.error());
+        if (!*row)
+            break;
+        ++lookedAt;
+        next = selectFrom_.integer(0) + 1;
+        if (selectFrom_.integer(1) != largest->id)
+            continue;
+        const auto message = look(selectFrom_.integer(0));
+        if (!message)
+            return std::unexpected(message.error());
+        counted += static_cast<std::uint64_t>(message->bytes + EventHolders::bytesBesidesPayload);
+        doomed.push_back(*message);
+    }
+    selectFrom_.reset();
+    holders_.setOldest(largest->id, next);
+    if (doomed.empty() && lookedAt < mostLookedAt)
+        holders_.setEmpty(largest->id);
+    if (const auto done = remove(doomed); !done)
+        return std::unexpected(done.error());
+    return Removal{
+        .events = eventsOf(doomed), .holder = largest->holder, .isOnlyHolder = largest->isOnlyOne, .isDone = false};
+}
+
+SqliteEventFile::Expected<SqliteEventFile::Doomed> SqliteEventFile::look(std::int64_t id)
+{
+    selectOne_.bind(1, id);
+    const auto row = selectOne_.step();
+    if (!row)
+        return std::unexpected(row.error());
+    if (!*row)
+        return std::unexpected(StoreError::Corrupt); // a message without its kind
+    const Doomed message{id, selectOne_.integer(0), selectOne_.integer(1), selectOne_.integer(2)};
+    selectOne_.reset();
+    return message;
+}
+
+std::uint64_t SqliteEventFile::eventsOf(const std::vector<Doomed>& doomed)
+{
+    std::int64_t events = 0;
+    for (const Doomed& message : doomed)
+        events += message.events;
     return static_cast<std::uint64_t>(events);
+}
+
+SqliteEventFile::Expected<> SqliteEventFile::remove(const std::vector<Doomed>& doomed)
+{
+    return inTransaction([&]() -> Expected<> {
+        for (const auto& [id, events, bytes, holder] : doomed) {
+            delete_.bind(1, id);
+            if (const auto done = delete_.run(); !done)
+                return done;
+            holders_.remove(holder, bytes);
+        }
+        counts_.counts().removed += static_cast<std::int64_t>(eventsOf(doomed));
+        return originRows_.removeUnused();
+    });
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::shrink(std::uint64_t mostBytes)

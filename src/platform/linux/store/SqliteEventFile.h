@@ -10,6 +10,7 @@
 #include "platform/linux/store/AgeClock.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
 #include "platform/linux/store/EventAges.h"
+#include "platform/linux/store/EventHolders.h"
 #include "platform/linux/store/EventKinds.h"
 #include "platform/linux/store/FirstEdition.h"
 #include "platform/linux/store/OriginRows.h"
@@ -22,6 +23,8 @@
 #include <memory>
 #include <optional>
 #include <span>
+#include <utility>
+#include <vector>
 
 namespace platform {
 
@@ -74,9 +77,15 @@ public:
     // Deletes messages that were kept so many seconds ago or earlier, at most `most`. Returns how many events they
     // were.
     [[nodiscard]] Expected<std::uint64_t> deleteOlderThan(double seconds, std::uint64_t most);
-    // Deletes the oldest messages until they have freed so many bytes, but at most `most` of them. Returns how many
-    // events they were.
-    [[nodiscard]] Expected<std::uint64_t> deleteOldest(std::uint64_t bytes, std::uint64_t most);
+    struct Removal {
+        std::uint64_t events = 0;
+        EventHolder holder;
+        bool isOnlyHolder = false;
+        bool isDone = false; // no more can be removed
+    };
+    // Deletes the oldest messages of the largest holder until they have freed so many bytes, but at most `most` of
+    // them. It looks at so many messages that new events hardly wait, so it may find none and still not be done.
+    [[nodiscard]] Expected<Removal> deleteOfLargestHolder(std::uint64_t bytes, std::uint64_t most);
     // Returns free room of the file to the file system, at most so many bytes.
     [[nodiscard]] Expected<> shrink(std::uint64_t mostBytes);
 
@@ -95,9 +104,19 @@ private:
     [[nodiscard]] Expected<> beginRun();
     [[nodiscard]] Expected<> keepTime();
     [[nodiscard]] Expected<> markFirstEdition(std::int64_t id, double time);
-    [[nodiscard]] Expected<> insert(std::int64_t id, const EventRow& row);
+    [[nodiscard]] Expected<> insert(std::int64_t id, const EventRow& row, std::int64_t holder);
     template <typename Work> [[nodiscard]] Expected<> inTransaction(Work work);
-    [[nodiscard]] Expected<std::uint64_t> deleteSelected(const SqliteStatement& select, std::uint64_t bytes);
+    struct Doomed {
+        std::int64_t id;
+        std::int64_t events;
+        std::int64_t bytes; // of the payload
+        std::int64_t holder;
+    };
+    static constexpr std::uint64_t mostLookedAt = 8192; // messages, for those of one holder
+    [[nodiscard]] Expected<std::int64_t> holderOf(const Origin& origin);
+    [[nodiscard]] Expected<Doomed> look(std::int64_t id);
+    [[nodiscard]] static std::uint64_t eventsOf(const std::vector<Doomed>& doomed);
+    [[nodiscard]] Expected<> remove(const std::vector<Doomed>& doomed);
 
     const std::filesystem::path path_;
     const Clock& clock_;
@@ -110,6 +129,8 @@ private:
     StoreCountsRow counts_;
     EventKinds kinds_;
     OriginRows originRows_;
+    EventHolders holders_;
+    std::optional<std::pair<Origin, std::int64_t>> lastHolder_; // of the running transaction
     EventAges ages_;
     std::optional<AgeClock> ageClock_;
     std::optional<AgeClock> committedAgeClock_;
@@ -119,7 +140,8 @@ private:
     SqliteStatement commit_;
     SqliteStatement insert_;
     SqliteStatement selectBelow_;
-    SqliteStatement selectOldest_;
+    SqliteStatement selectFrom_;
+    SqliteStatement selectOne_;
     SqliteStatement delete_;
 };
 

@@ -47,7 +47,8 @@ SqliteKeeper::SqliteKeeper(const fs::path& directory, const Clock& clock, Provid
     : path_(directory / fileName),
       clock_(clock),
       log_(log),
-      losses_(path_, clock, log)
+      losses_(path_, clock, log),
+      removals_(clock, log)
 {
     origins_.bootIdentifier = bootIdentifier();
 }
@@ -251,6 +252,7 @@ bool SqliteKeeper::awaitsQuiet() const
 bool SqliteKeeper::tidy(bool isQuiet, ledger::Tally& tally)
 {
     losses_.report();
+    removals_.report();
     if (!database_)
         return false;
     if (database_->logBytes() < logBytesAtCheckpoint_)
@@ -317,21 +319,39 @@ bool SqliteKeeper::makeRoom(ledger::Tally& tally)
     return size.has_value();
 }
 
+void SqliteKeeper::count(const SqliteEventFile::Removal& removal, ledger::Tally& tally)
+{
+    using enum ledger::Counter;
+    const auto& [user, process, application] = removal.holder;
+    (removal.isOnlyHolder ? removals_.removed().forSize : removals_.removed().forShare) += removal.events;
+    const ledger::Counter counter = removal.isOnlyHolder ? RemovedForSize : RemovedForShare;
+    if (user)
+        tally.add(counter, ledger::Culprit{*user, process, application}, removal.events);
+    else
+        tally.add(counter, removal.events);
+}
+
 // False if nothing is left to do.
 SqliteKeeper::Expected<bool> SqliteKeeper::makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally)
 {
-    const bool isTooLarge = size.usedBytes > maximumBytes();
-    const auto deleted = isTooLarge
-        ? database_->deleteOldest(size.usedBytes - maximumBytes(), eventsDeletedAtOnce)
-        : database_->deleteOlderThan(configuration_.maximumAgeDays * secondsADay, eventsDeletedAtOnce);
-    if (!deleted)
-        return std::unexpected(deleted.error());
-    tally.add(isTooLarge ? ledger::Counter::RemovedForSize : ledger::Counter::RemovedForAge, *deleted);
+    const auto aged = database_->deleteOlderThan(configuration_.maximumAgeDays * secondsADay, eventsDeletedAtOnce);
+    if (!aged)
+        return std::unexpected(aged.error());
+    tally.add(ledger::Counter::RemovedForAge, *aged);
+    removals_.removed().forAge += *aged;
+    bool hasRemoved = *aged > 0;
+    if (!hasRemoved && size.usedBytes > maximumBytes()) {
+        const auto removal = database_->deleteOfLargestHolder(size.usedBytes - maximumBytes(), eventsDeletedAtOnce);
+        if (!removal)
+            return std::unexpected(removal.error());
+        count(*removal, tally);
+        hasRemoved = !removal->isDone;
+    }
     oldest_ = database_->oldest().value_or(0);
     // New events fill the room of deleted ones; the file shrinks only if far too much of it is free.
     const bool isFileTooLarge = size.usedBytes + size.freeBytes > maximumBytes() + maximumBytes() / 8;
-    if (*deleted > 0 || !isFileTooLarge || size.freeBytes == 0)
-        return *deleted > 0;
+    if (hasRemoved || !isFileTooLarge || size.freeBytes == 0)
+        return hasRemoved;
     if (const auto done = database_->shrink(bytesTidiedAtOnce); !done)
         return std::unexpected(done.error());
     return true;

@@ -6,6 +6,7 @@
 #include "platform/linux/log/ProviderLog.h"
 #include "platform/linux/store/EventKeeper.h"
 #include "platform/linux/store/EventLosses.h"
+#include "platform/linux/store/RemovalReport.h"
 #include "platform/linux/store/SqliteEventFile.h"
 
 #include <cstdint>
@@ -62,6 +63,7 @@ private:
     void lose(StoreError reason, std::uint64_t events, ledger::Tally& tally);
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     bool emptyLog();
+    void count(const SqliteEventFile::Removal& removal, ledger::Tally& tally);
     [[nodiscard]] bool moveFirstEdition(ledger::Tally& tally);
     [[nodiscard]] bool makeRoom(ledger::Tally& tally);
     [[nodiscard]] Expected<bool> makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally);
@@ -72,6 +74,7 @@ private:
     const ProviderLog log_;
     AnalyticsConfiguration configuration_;
     EventLosses losses_;
+    RemovalReport removals_;
     KnownOrigins origins_;
 
     std::unique_ptr<SqliteEventFile> database_; // null: could not be opened

@@ -26,7 +26,7 @@ constexpr std::string_view tables =
     "CREATE INDEX kinds_by_second_name ON kinds(second_name) WHERE second_name IS NOT NULL;"
     "CREATE TABLE messages("
     "id INTEGER PRIMARY KEY, time REAL NOT NULL, kind INTEGER NOT NULL, session INTEGER, source INTEGER,"
-    " happened REAL, payload TEXT NOT NULL"
+    " happened REAL, holder INTEGER NOT NULL, payload TEXT NOT NULL"
     ") STRICT;"
     "CREATE INDEX messages_by_kind ON messages(kind, time);"
     "CREATE INDEX messages_by_second_id ON messages(CAST(id + 1 AS INTEGER));"
@@ -42,6 +42,8 @@ constexpr std::string_view tables =
     "id INTEGER PRIMARY KEY, source INTEGER, reporter INTEGER NOT NULL, service TEXT, application TEXT NOT NULL,"
     " began REAL NOT NULL, ended REAL, past INTEGER"
     ") STRICT;"
+    "CREATE INDEX sources_by_past ON sources(past) WHERE past IS NOT NULL;"
+    "CREATE INDEX sessions_by_past ON sessions(past) WHERE past IS NOT NULL;"
     "CREATE TABLE store("
     "row INTEGER PRIMARY KEY CHECK (row = 1), epoch TEXT NOT NULL,"
     " next_event INTEGER NOT NULL, next_source INTEGER NOT NULL, next_session INTEGER NOT NULL,"
@@ -49,6 +51,10 @@ constexpr std::string_view tables =
     " age_time REAL NOT NULL, wall_time REAL, away REAL NOT NULL, trial REAL NOT NULL, away_below INTEGER NOT NULL"
     ") STRICT;"
     "INSERT INTO store VALUES (1, lower(hex(randomblob(16))), 1, 1, 1, 0, 0, 0, NULL, 0, 0, 0);"
+    "CREATE TABLE holders("
+    "id INTEGER PRIMARY KEY, user INTEGER, process TEXT NOT NULL, application TEXT NOT NULL,"
+    " bytes INTEGER NOT NULL, oldest INTEGER NOT NULL"
+    ") STRICT;"
     "CREATE TABLE ages(below INTEGER PRIMARY KEY, kept REAL NOT NULL) STRICT;";
 
 constexpr std::string_view view =

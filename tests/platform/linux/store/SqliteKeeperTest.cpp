@@ -43,6 +43,7 @@ using foundation::Dictionary;
 using support::LogLine;
 using support::StoreReader;
 using testing::AllOf;
+using testing::Contains;
 using testing::Each;
 using testing::ElementsAre;
 using testing::Field;
@@ -1189,6 +1190,195 @@ TEST_F(SqliteKeeperTest, WhatIsTooMuchGoesOldestFirst)
     EXPECT_EQ(reader.number("SELECT max(id) - min(id) + 1 - count(*) FROM events"), 0); // no gap: the oldest went first
     EXPECT_GT(reader.eventCount(), 3000);
     EXPECT_EQ(reader.text("PRAGMA integrity_check"), "ok");
+}
+
+// --- Shares
+
+class SharesTest : public OriginsTest {
+protected:
+    void SetUp() override { configuration.maximumSizeMegabytes = 4; }
+    // Events of a source, some bytes each.
+    void send(std::uint64_t source, int count, std::size_t bytes, std::uint64_t session = 0)
+    {
+        for (int number = 0; number < count; ++number)
+            batch.add(clock.secondsSince1970(), {.source = source, .session = session}, "a",
+                      Dictionary{{"text", std::string(bytes, 'x')}, {"n", number}});
+        keepBatch();
+        maintain();
+    }
+    std::int64_t left(std::uint64_t row)
+    {
+        return StoreReader(file()).number(fmt::format("SELECT count(*) FROM events WHERE source = {}", row));
+    }
+};
+
+TEST_F(SharesTest, ManyLargeEventsOfOneDoNotPushOutTheEventsOfOthers)
+{
+    begin(1, "modest", 1000);
+    begin(2, "greedy", 1001);
+    send(1, 4000, 300);
+    for (int number = 0; number < 136; ++number)
+        send(2, 1, megabyte);
+    EXPECT_EQ(left(1), 4000);
+    EXPECT_GE(left(2), 1);
+    EXPECT_EQ(tally[ledger::Counter::RemovedForShare], 136U - static_cast<std::uint64_t>(left(2)));
+    EXPECT_EQ(tally[ledger::Counter::RemovedForSize], 0U);
+    EXPECT_THAT(tally.charged(),
+                Contains(AllOf(Field(&ledger::Tally::Charged::culprit,
+                                     ledger::Culprit{.user = 1001, .process = "greedy", .application = ""}),
+                               Field(&ledger::Tally::Charged::count, 136U - static_cast<std::uint64_t>(left(2))))));
+    EXPECT_EQ(StoreReader(file()).number("SELECT max(payload ->> 'n') FROM events WHERE source = 1"), 3999);
+}
+
+TEST_F(SharesTest, TheOldestOfTheLargestGoFirst)
+{
+    begin(1, "modest", 1000);
+    begin(2, "greedy", 1001);
+    send(2, 1000, 1000);
+    send(1, 1000, 300);
+    for (int round = 0; round < 10; ++round)
+        send(2, 1000, 1000);
+    EXPECT_EQ(left(2), 1000) << "the modest one came second";
+    EXPECT_LT(left(1), 4000);
+    StoreReader reader(file());
+    EXPECT_EQ(reader.number("SELECT max(id) FROM events WHERE source = 1"), 12'000);
+    EXPECT_EQ(reader.number("SELECT max(id) - min(id) + 1 - count(*) FROM events WHERE source = 1 AND id > 2000"), 0);
+}
+
+TEST_F(SharesTest, AmongProcessesOfOneUserTheLargestGivesWay)
+{
+    begin(1, "modest", 1000);
+    begin(2, "greedy", 1000);
+    send(1, 3000, 300);
+    for (int round = 0; round < 20; ++round)
+        send(2, 1000, 300);
+    EXPECT_EQ(left(1), 3000);
+}
+
+TEST_F(SharesTest, AmongApplicationsOfOneProcessTheLargestGivesWay)
+{
+    begin(1, "server", 1000);
+    beginSession(1, 1, "modest");
+    beginSession(2, 1, "greedy");
+    send(1, 3000, 300, 1);
+    for (int round = 0; round < 20; ++round)
+        send(1, 1000, 300, 2);
+    EXPECT_EQ(StoreReader(file()).number("SELECT count(*) FROM events WHERE session = 1"), 3000);
+}
+
+TEST_F(SharesTest, WhoReportsUnderManyNamesGainsNothing)
+{
+    begin(1, "modest", 1000);
+    begin(2, "greedy", 1000);
+    for (std::uint64_t session = 1; session <= 100; ++session)
+        beginSession(session, 2, fmt::format("name {}", session));
+    send(1, 3000, 300);
+    for (std::uint64_t session = 1; session <= 100; ++session)
+        send(2, 200, 300, session);
+    EXPECT_EQ(left(1), 3000);
+    EXPECT_LE(StoreReader(file()).number("SELECT count(*) FROM holders WHERE process = 'greedy'"), 65);
+}
+
+TEST_F(SharesTest, ManyProcessesOfAUserGainNothingAgainstAnotherUser)
+{
+    begin(1, "modest", 1000);
+    send(1, 3000, 300);
+    for (std::uint64_t source = 2; source < 102; ++source) {
+        begin(source, fmt::format("process {}", source), 1001);
+        send(source, 200, 300);
+    }
+    EXPECT_EQ(left(1), 3000);
+    EXPECT_LE(StoreReader(file()).number("SELECT count(*) FROM holders WHERE user = 1001"), 65);
+}
+
+TEST_F(SharesTest, WithOneHolderTheOldestGoForTheSize)
+{
+    begin(1);
+    for (int round = 0; round < 20; ++round)
+        send(1, 1000, 300);
+    EXPECT_GT(tally[ledger::Counter::RemovedForSize], 1000U);
+    EXPECT_EQ(tally[ledger::Counter::RemovedForShare], 0U);
+    EXPECT_EQ(StoreReader(file()).number("SELECT max(id) - min(id) + 1 - count(*) FROM events"), 0);
+}
+
+TEST_F(SharesTest, WhatEachHoldsIsKnownAgainAfterAStart)
+{
+    begin(1, "modest", 1000);
+    begin(2, "greedy", 1001);
+    send(1, 100, 1000);
+    send(2, 200, 1000);
+    const std::string sql = "SELECT user || ' ' || process || ' ' || bytes FROM holders ORDER BY user";
+    const auto before = StoreReader(file()).texts(sql);
+    EXPECT_THAT(before, ElementsAre("1000 modest 108190", "1001 greedy 216490"));
+    closeWriter();
+    begin(3, "modest", 1000);
+    send(3, 1, 1000);
+    EXPECT_THAT(StoreReader(file()).texts(sql), ElementsAre("1000 modest 109271", "1001 greedy 216490"));
+}
+
+TEST_F(SharesTest, AHolderWithoutEventsIsForgotten)
+{
+    begin(1, "modest", 1000);
+    send(1, 100, 1000);
+    clock.advance(91 * day);
+    begin(2, "other", 1000);
+    send(2, 1, 10);
+    EXPECT_THAT(StoreReader(file()).texts("SELECT process FROM holders"), ElementsAre("other"));
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM sources ORDER BY id"), ElementsAre("modest", "other"))
+        << "it has not ended";
+}
+
+TEST_F(SharesTest, SourcesAndSessionsGoAfterTheirLastEvent)
+{
+    begin(1, "first");
+    beginSession(1, 1);
+    send(1, 1, 10, 1);
+    batch.announceSessionEnd({.number = 1, .time = 2});
+    batch.announceSourceEnd({.number = 1, .time = 2});
+    keepBatch();
+    begin(2, "second");
+    send(2, 1, 10);
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM sources ORDER BY id"), ElementsAre("first", "second"));
+    clock.advance(50 * day);
+    send(2, 1, 10);
+    clock.advance(50 * day);
+    maintain();
+    EXPECT_EQ(StoreReader(file()).eventCount(), 1);
+    EXPECT_THAT(StoreReader(file()).texts("SELECT name FROM sources ORDER BY id"), ElementsAre("second"));
+    EXPECT_EQ(StoreReader(file()).number("SELECT count(*) FROM sessions"), 0);
+}
+
+TEST_F(SharesTest, RemovalsAreSaidOnceAnHour)
+{
+    std::uint64_t sum = 0;
+    const auto said = [&] {
+        std::vector<std::string> lines;
+        for (const LogLine& line : log.take()) {
+            lines.push_back(line.message.substr(0, line.message.find(';')));
+            sum += std::stoul(line.message);
+        }
+        return lines;
+    };
+    configuration.maximumAgeDays = 1;
+    begin(1);
+    send(1, 10, 10);
+    EXPECT_THAT(said(), IsEmpty());
+    clock.advance(2 * day);
+    send(1, 5, 10);
+    EXPECT_THAT(said(), IsEmpty()) << "with the next tidying";
+    maintain();
+    EXPECT_THAT(said(),
+                ElementsAre("10 analytics events were removed: 10 were too old, 0 were the oldest of too many, "
+                            "0 were the oldest of who holds most"));
+    for (int round = 0; round < 20; ++round)
+        send(1, 1000, 300);
+    EXPECT_THAT(said(), IsEmpty());
+    clock.advance(hour);
+    maintain();
+    EXPECT_THAT(said(), SizeIs(1));
+    closeWriter();
+    EXPECT_THAT(said(), SizeIs(testing::Le(1))) << "what is not said yet is said at the end";
+    EXPECT_EQ(sum, tally[ledger::Counter::RemovedForAge] + tally[ledger::Counter::RemovedForSize]);
 }
 
 TEST_F(SqliteKeeperTest, FewButLargeEventsDoNotSlipThroughTheBound)
