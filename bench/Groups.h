@@ -9,6 +9,7 @@ namespace bench {
 void measureRoundTrip(const BenchOptions& options, Report& report);
 void measurePipeline(const BenchOptions& options, Report& report);
 void measureStored(const BenchOptions& options, Report& report);
+void measureStoredQueries(const BenchOptions& options, Report& report);
 void measureGrowingSession(const BenchOptions& options, Report& report);
 void measureSessionEnd(const BenchOptions& options, Report& report);
 void measureEndedSessions(const BenchOptions& options, Report& report);

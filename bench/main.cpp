@@ -24,6 +24,7 @@ constexpr std::array groups{
     MeasurementGroup{"roundtrip", "waiting for the answer to a message", measureRoundTrip},
     MeasurementGroup{"pipeline", "messages a second, none stored", measurePipeline},
     MeasurementGroup{"stored", "messages a second that become stored events", measureStored},
+    MeasurementGroup{"query", "queries of ten million stored events", measureStoredQueries},
     MeasurementGroup{"session", "recording a million messages: time and memory", measureGrowingSession},
     MeasurementGroup{"end", "the end of a session of a million messages", measureSessionEnd},
     MeasurementGroup{"ended", "the memory that stays of sessions that ended", measureEndedSessions},

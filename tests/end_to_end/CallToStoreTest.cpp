@@ -61,6 +61,44 @@ TEST_F(CallToStoreTest, AMessageBecomesTwoStoredEventsWithTheApplicationAdded)
     EXPECT_EQ(events[1].payload, events[0].payload);
 }
 
+TEST_F(CallToStoreTest, EventsOfOneStreamCanBePairedAndNameWhoSentThem)
+{
+    {
+        WireClient client(kestod.socketPath());
+        WireClient other(kestod.socketPath());
+        for (const int reporter : {42, 43}) {
+            client.ask(Create, reporter);
+            client.ask(SetServiceType, 7, reporter);
+            client.ask(SetConfiguration, Dictionary{{"HostApplicationDisplayID", "org.example.player"}}, reporter);
+        }
+        const auto say = [](WireClient& sender, int reporter, int type, double time) {
+            sender.ask(SendMessage, Dictionary{{"kestoreporting_timestamp", time}}, playback, type, Array{reporter});
+        };
+        say(client, 42, typeStart, 100);
+        say(client, 43, typeStart, 101);
+        say(client, 42, typeStop, 103.5);
+        say(other, 43, typeStop, 111);
+        client.ask(Destroy, 42);
+    }
+    EXPECT_TRUE(waitUntil([&] { return kestod.events(uptimeEvent).size() == 2; }));
+    EXPECT_EQ(kestod.query("SELECT count(*) FROM messages"), std::vector<std::string>{"6"})
+        << "four messages, and two clients that ended";
+    EXPECT_THAT(kestod.query("SELECT sum(iif(name GLOB '*.Stop', happened, -happened)) || ' ' || reporter || ' ' || "
+                             "service || ' ' || application FROM events JOIN sessions ON sessions.id = session "
+                             "WHERE name GLOB 'com.quarn.kesto.Playback.*' GROUP BY session ORDER BY reporter"),
+                ElementsAre("3.5 42 longformaudio org.example.player", "10.0 43 longformaudio org.example.player"));
+    EXPECT_THAT(kestod.query("SELECT count(DISTINCT source) FROM events WHERE session IS NOT NULL"), ElementsAre("2"));
+    EXPECT_THAT(kestod.query("SELECT DISTINCT process || ' ' || user FROM sources"),
+                ElementsAre(std::to_string(::getpid()) + " " + std::to_string(::getuid())));
+    EXPECT_THAT(kestod.query("SELECT count(*) FROM events WHERE source IS NULL"), ElementsAre("0"));
+    EXPECT_TRUE(waitUntil([&] {
+        return kestod
+            .query("SELECT id FROM sources WHERE ended IS NULL UNION ALL SELECT id FROM sessions WHERE ended IS "
+                   "NULL")
+            .empty();
+    }));
+}
+
 TEST_F(CallToStoreTest, WhatIsAcknowledgedIsKeptWhenTheServiceIsKilled)
 {
     WireClient client(kestod.socketPath());

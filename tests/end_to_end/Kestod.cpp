@@ -174,6 +174,24 @@ std::vector<StoreRow> Kestod::events(std::string_view pattern) const
     return *std::move(events);
 }
 
+std::vector<std::string> Kestod::query(const std::string& sql) const
+{
+    std::vector<std::string> rows;
+    const auto note = [](void* texts, int, char** columns, char**) {
+        static_cast<std::vector<std::string>*>(texts)->emplace_back(columns[0] == nullptr ? "NULL" : columns[0]);
+        return SQLITE_OK;
+    };
+    sqlite3* database = nullptr;
+    sqlite3_open_v2((directory() / "state" / "analytics.sqlite3").c_str(), &database, SQLITE_OPEN_READONLY, nullptr);
+    sqlite3_busy_timeout(database, 10'000);
+    const int status = sqlite3_exec(database, sql.c_str(), note, &rows, nullptr);
+    const std::string problem = sqlite3_errmsg(database);
+    sqlite3_close(database);
+    if (status != SQLITE_OK)
+        throw std::runtime_error("the store cannot be read: " + problem);
+    return rows;
+}
+
 std::uint64_t Kestod::eventCount() const
 {
     const fs::path path = directory() / "state" / "analytics.sqlite3";

@@ -85,6 +85,8 @@ public:
 
     // The stored events of names that match the pattern (GLOB), in order. Throws if the store cannot be read.
     [[nodiscard]] std::vector<StoreRow> events(std::string_view pattern = "*") const;
+    // The first column of the rows of a query of the store. Throws if it cannot be read.
+    [[nodiscard]] std::vector<std::string> query(const std::string& sql) const;
     // How many events the store holds. Throws if it cannot be read.
     [[nodiscard]] std::uint64_t eventCount() const;
     // Waits for such an event.

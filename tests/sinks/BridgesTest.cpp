@@ -49,6 +49,29 @@ TEST_F(FennicBridgeTest, OffersAnEventForAllServicesAndThenOneForTheSessionsOwn)
                 ElementsAre("com.quarn.kesto.Playback.Start", "com.quarn.telephony.Playback.Start"));
 }
 
+TEST_F(FennicBridgeTest, SaysWhoIsBehindTheEventsAndAnnouncesItOnce)
+{
+    platform.analytics.use("*");
+    session->origin = {.source = 3, .session = 4};
+    send({});
+    EXPECT_THAT(platform.analytics.origins(),
+                ElementsAre(platform::Origin{.source = 3, .session = 4}, platform::Origin{.source = 3, .session = 4}))
+        << "the session's owner";
+    EXPECT_THAT(platform.turn.events.announcements().sessions, ElementsAre(platform::SessionBegin{.number = 4}));
+    platform.analytics.clear();
+    KestoReportingFennicBridge::handleEvent(platform.turn, {}, 4, 1, session, 9);
+    EXPECT_THAT(platform.analytics.origins(),
+                ElementsAre(platform::Origin{.source = 9, .session = 4}, platform::Origin{.source = 9, .session = 4}))
+        << "another client sent the message";
+}
+
+TEST_F(FennicBridgeTest, AnnouncesNothingForEventsThatAreNotWanted)
+{
+    session->origin = {.source = 3, .session = 4};
+    send({});
+    EXPECT_TRUE(platform.turn.events.empty());
+}
+
 TEST_F(FennicBridgeTest, SendsTheFirstEventBeforeItAsksAboutTheSecond)
 {
     platform.analytics.use("*");

@@ -163,7 +163,7 @@ SqliteEventFile::Expected<> SqliteEventFile::setSynchronization(StoreSynchroniza
 
 SqliteEventFile::Expected<> SqliteEventFile::begin()
 {
-    lastHolder_.reset();
+    lastResolved_.reset();
     return begin_.run();
 }
 
@@ -171,12 +171,12 @@ SqliteEventFile::Expected<> SqliteEventFile::insert(std::span<const EventRow> ro
 {
     StoreCounts& counts = counts_.counts();
     for (const EventRow& row : rows) {
-        const auto holder = holderOf(row.origin);
-        if (!holder)
-            return std::unexpected(holder.error());
-        if (const auto done = insert(counts.nextEvent, row, *holder); !done)
+        const auto resolved = resolve(row.origin);
+        if (!resolved)
+            return std::unexpected(resolved.error());
+        if (const auto done = insert(counts.nextEvent, row, *resolved); !done)
             return done;
-        holders_.add(*holder, row.payload.size());
+        holders_.add(resolved->holder, row.payload.size());
         const auto events = static_cast<std::int64_t>(row.events());
         counts.nextEvent += events;
         counts.kept += events;
@@ -185,10 +185,10 @@ SqliteEventFile::Expected<> SqliteEventFile::insert(std::span<const EventRow> ro
 }
 
 // Neighbours mostly have the same origin.
-SqliteEventFile::Expected<std::int64_t> SqliteEventFile::holderOf(const Origin& origin)
+SqliteEventFile::Expected<SqliteEventFile::Resolved> SqliteEventFile::resolve(const Origin& origin)
 {
-    if (lastHolder_ && lastHolder_->first == origin)
-        return lastHolder_->second;
+    if (lastResolved_ && lastResolved_->origin == origin)
+        return *lastResolved_;
     EventHolder holder;
     if (const auto* source = origins_.sources.find(origin.source)) {
         holder.user = source->begin.userIdentifier;
@@ -197,12 +197,16 @@ SqliteEventFile::Expected<std::int64_t> SqliteEventFile::holderOf(const Origin& 
             holder.application = session->begin.application;
     }
     const auto id = holders_.idOf(std::move(holder), counts_.counts().nextEvent);
-    if (id)
-        lastHolder_ = {origin, *id};
-    return id;
+    if (!id)
+        return std::unexpected(id.error());
+    const auto rows = originRows_.of(origin, origins_, counts_.counts());
+    if (!rows)
+        return std::unexpected(rows.error());
+    lastResolved_ = {origin, *rows, *id};
+    return *lastResolved_;
 }
 
-SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const EventRow& row, std::int64_t holder)
+SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const EventRow& row, const Resolved& resolved)
 {
     const auto kind = kinds_.idOf(row.name, row.secondName);
     if (!kind)
@@ -210,13 +214,10 @@ SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const Event
     insert_.bind(1, id);
     insert_.bind(2, row.time);
     insert_.bind(3, *kind);
-    const auto rows = originRows_.of(row.origin, origins_, counts_.counts());
-    if (!rows)
-        return std::unexpected(rows.error());
-    insert_.bind(4, rows->session);
-    insert_.bind(5, rows->source);
+    insert_.bind(4, resolved.rows.session);
+    insert_.bind(5, resolved.rows.source);
     insert_.bind(6, row.happened);
-    insert_.bind(7, holder);
+    insert_.bind(7, resolved.holder);
     insert_.bind(8, row.payload); // every payload is far shorter than SQLite's limit
     return insert_.run();
 }
@@ -276,15 +277,15 @@ SqliteEventFile::Expected<> SqliteEventFile::moveFirstEdition()
         return StoreSchema::dropFirstEdition(*connection_);
     }
     return inTransaction([&]() -> Expected<> {
-        const auto holder = holderOf({});
-        if (!holder)
-            return std::unexpected(holder.error());
+        const auto resolved = resolve({});
+        if (!resolved)
+            return std::unexpected(resolved.error());
         for (const auto& [id, time, happened, name, secondName, payload] : *messages) {
             if (const auto done = markFirstEdition(id, time); !done)
                 return done;
-            if (const auto done = insert(id, {time, happened, {}, name, secondName, payload}, *holder); !done)
+            if (const auto done = insert(id, {time, happened, {}, name, secondName, payload}, *resolved); !done)
                 return done;
-            holders_.add(*holder, payload.size(), id);
+            holders_.add(resolved->holder, payload.size(), id);
         }
         return firstEdition_->remove(*messages, counts_.counts());
     });

@@ -7,15 +7,15 @@
 
 #include "platform/EventBatch.h"
 #include "platform/linux/files/FileDescriptor.h"
-#include "platform/linux/store/AgeClock.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
-#include "platform/linux/store/EventAges.h"
-#include "platform/linux/store/EventHolders.h"
-#include "platform/linux/store/EventKinds.h"
-#include "platform/linux/store/FirstEdition.h"
-#include "platform/linux/store/OriginRows.h"
 #include "platform/linux/store/SqliteConnection.h"
-#include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/tables/AgeClock.h"
+#include "platform/linux/store/tables/EventAges.h"
+#include "platform/linux/store/tables/EventHolders.h"
+#include "platform/linux/store/tables/EventKinds.h"
+#include "platform/linux/store/tables/FirstEdition.h"
+#include "platform/linux/store/tables/OriginRows.h"
+#include "platform/linux/store/tables/StoreSchema.h"
 
 #include <chrono>
 #include <cstdint>
@@ -90,6 +90,12 @@ public:
     [[nodiscard]] Expected<> shrink(std::uint64_t mostBytes);
 
 private:
+    struct Resolved { // who is behind an origin
+        Origin origin;
+        OriginRows::Rows rows;
+        std::int64_t holder = 0;
+    };
+
     SqliteEventFile(std::filesystem::path path, const Clock& clock, KnownOrigins& origins)
         : path_(std::move(path)),
           clock_(clock),
@@ -104,7 +110,7 @@ private:
     [[nodiscard]] Expected<> beginRun();
     [[nodiscard]] Expected<> keepTime();
     [[nodiscard]] Expected<> markFirstEdition(std::int64_t id, double time);
-    [[nodiscard]] Expected<> insert(std::int64_t id, const EventRow& row, std::int64_t holder);
+    [[nodiscard]] Expected<> insert(std::int64_t id, const EventRow& row, const Resolved& resolved);
     template <typename Work> [[nodiscard]] Expected<> inTransaction(Work work);
     struct Doomed {
         std::int64_t id;
@@ -113,7 +119,7 @@ private:
         std::int64_t holder;
     };
     static constexpr std::uint64_t mostLookedAt = 8192; // messages, for those of one holder
-    [[nodiscard]] Expected<std::int64_t> holderOf(const Origin& origin);
+    [[nodiscard]] Expected<Resolved> resolve(const Origin& origin);
     [[nodiscard]] Expected<Doomed> look(std::int64_t id);
     [[nodiscard]] static std::uint64_t eventsOf(const std::vector<Doomed>& doomed);
     [[nodiscard]] Expected<> remove(const std::vector<Doomed>& doomed);
@@ -130,7 +136,7 @@ private:
     EventKinds kinds_;
     OriginRows originRows_;
     EventHolders holders_;
-    std::optional<std::pair<Origin, std::int64_t>> lastHolder_; // of the running transaction
+    std::optional<Resolved> lastResolved_; // of the running transaction
     EventAges ages_;
     std::optional<AgeClock> ageClock_;
     std::optional<AgeClock> committedAgeClock_;

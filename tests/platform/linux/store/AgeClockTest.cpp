@@ -1,5 +1,5 @@
 // The age time of the store: clocks that are wrong, set, or stand still do not make events older than they are.
-#include "platform/linux/store/AgeClock.h"
+#include "platform/linux/store/tables/AgeClock.h"
 
 #include "platform/linux/store/ManualClock.h"
 

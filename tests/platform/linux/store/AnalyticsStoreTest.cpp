@@ -198,7 +198,9 @@ TEST_F(AnalyticsStoreTest, CountsTheEventsThatItGivesUp)
     auto slow = std::make_unique<SlowKeeper>(std::make_shared<support::KeptEvents>(), clock);
     SlowKeeper& keeper = *slow;
     AnalyticsStore tested(std::move(slow), watcher, clock, ledger, ProviderLog(log), limits);
-    const auto sendOne = [&] { tested.sendAnalyticsEventLazy(outsideTurn, eventName, [] { return Dictionary(); }); };
+    const auto sendOne = [&] {
+        tested.sendAnalyticsEventLazy(outsideTurn, {}, eventName, [] { return Dictionary(); });
+    };
     EXPECT_EQ(tested.giveUp(), 0U);
     sendOne();
     keeper.isKeeping.get_future().wait();

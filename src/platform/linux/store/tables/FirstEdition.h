@@ -7,7 +7,7 @@
 #pragma once
 
 #include "platform/linux/store/SqliteConnection.h"
-#include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/tables/StoreSchema.h"
 
 #include <cstdint>
 #include <functional>

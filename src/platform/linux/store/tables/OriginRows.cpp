@@ -1,5 +1,5 @@
 // `past` is the ID from which on a source or a session that ended has no events.
-#include "platform/linux/store/OriginRows.h"
+#include "platform/linux/store/tables/OriginRows.h"
 
 #include <initializer_list>
 #include <string_view>

@@ -1,6 +1,6 @@
 // The marks are few: two an hour at most, for as long as events are kept. An earlier mark of the same events stays,
 // because it says more.
-#include "platform/linux/store/EventAges.h"
+#include "platform/linux/store/tables/EventAges.h"
 
 #include <initializer_list>
 #include <string_view>

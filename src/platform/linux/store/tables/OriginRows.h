@@ -1,9 +1,9 @@
 // The rows of sources and sessions: who sent the events that the database holds.
 #pragma once
 
-#include "platform/linux/store/KnownOrigins.h"
 #include "platform/linux/store/SqliteConnection.h"
-#include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/tables/KnownOrigins.h"
+#include "platform/linux/store/tables/StoreSchema.h"
 
 #include <cstdint>
 #include <optional>

@@ -1,8 +1,11 @@
-// The tables of the store, and the one row that counts. docs/store.md describes them for those who query them.
+// The room of tables: what stands in the database beside the messages, each kind in a file, with its rows in memory
+// where that is needed. Everything changes with the transaction that SqliteEventFile runs, or is dropped with it.
+//
+// The schema, and the one row that counts. docs/store.md describes the tables for those who query them.
 #pragma once
 
-#include "platform/linux/store/AgeClock.h"
 #include "platform/linux/store/SqliteConnection.h"
+#include "platform/linux/store/tables/AgeClock.h"
 
 #include <cstdint>
 #include <string>

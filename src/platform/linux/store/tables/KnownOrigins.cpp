@@ -1,5 +1,5 @@
 // Sources and sessions side by side.
-#include "platform/linux/store/KnownOrigins.h"
+#include "platform/linux/store/tables/KnownOrigins.h"
 
 namespace platform {
 

@@ -1,5 +1,5 @@
 // Two neighbours with the same payload, sent at nearly the same time under two names, are the two events of a message.
-#include "platform/linux/store/FirstEdition.h"
+#include "platform/linux/store/tables/FirstEdition.h"
 
 #include <cmath>
 

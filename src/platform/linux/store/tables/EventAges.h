@@ -2,8 +2,8 @@
 // event's age depends on nothing that stands in its row.
 #pragma once
 
-#include "platform/linux/store/AgeClock.h"
 #include "platform/linux/store/SqliteConnection.h"
+#include "platform/linux/store/tables/AgeClock.h"
 
 #include <cstdint>
 

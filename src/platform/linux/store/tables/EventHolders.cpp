@@ -1,6 +1,6 @@
 // All holders are in memory; their rows are written with the transactions that change them. A holder without events
 // goes with the next.
-#include "platform/linux/store/EventHolders.h"
+#include "platform/linux/store/tables/EventHolders.h"
 
 #include <algorithm>
 #include <initializer_list>

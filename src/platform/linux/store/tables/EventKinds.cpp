@@ -1,5 +1,5 @@
 // A kind is looked up in the database once; then its ID is remembered.
-#include "platform/linux/store/EventKinds.h"
+#include "platform/linux/store/tables/EventKinds.h"
 
 namespace platform {
 

@@ -5,7 +5,7 @@
 // conditions: the second event's ID is cast, since both halves of the view must have columns of the same kind to be
 // merged in their order; it has an index of its own; and SQLite knows that kinds are few and messages many, from
 // figures that need not be exact.
-#include "platform/linux/store/StoreSchema.h"
+#include "platform/linux/store/tables/StoreSchema.h"
 
 #include <fmt/format.h>
 #include <string>
