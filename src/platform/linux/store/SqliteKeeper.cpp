@@ -234,6 +234,7 @@ void SqliteKeeper::handleFailure(StoreError error)
 {
     if (database_)
         database_->rollBack();
+    origins_.rolledBack();
     if (error == StoreError::DiskFull || error == StoreError::Locked || error == StoreError::LogHeld)
         return; // the connection can still be used
     const bool wasOpen = database_ != nullptr;

@@ -7,6 +7,7 @@
 
 #include "platform/Origin.h"
 
+#include <algorithm>
 #include <cstddef>
 #include <cstdint>
 #include <deque>
@@ -72,15 +73,19 @@ public:
     {
         inserted_.clear();
         changed_.clear();
-        for (const std::uint64_t number : forgotten_)
-            known_.erase(number);
-        forgotten_.clear();
+        forget();
     }
+    // Also called when no transaction could begin, so that a database that stays closed costs no memory.
     void rolledBack()
     {
         for (const std::uint64_t number : inserted_)
             known_[number].row = 0;
         inserted_.clear();
+        forget();
+        std::ranges::sort(changed_);
+        const auto repeated = std::ranges::unique(changed_);
+        changed_.erase(repeated.begin(), repeated.end());
+        std::erase_if(changed_, [this](std::uint64_t number) { return !known_.contains(number); });
     }
     // The database is another one.
     void forgetRows()
@@ -91,9 +96,16 @@ public:
     }
 
 private:
+    void forget()
+    {
+        for (const std::uint64_t number : forgotten_)
+            known_.erase(number);
+        forgotten_.clear();
+    }
+
     std::unordered_map<std::uint64_t, KnownOrigin<Begin>> known_;
     std::deque<std::uint64_t> ended_;
-    std::vector<std::uint64_t> forgotten_; // with the next commit
+    std::vector<std::uint64_t> forgotten_; // when the transaction is over
     std::vector<std::uint64_t> inserted_; // in the running transaction
     std::vector<std::uint64_t> changed_;
 };
