@@ -151,6 +151,9 @@ SqliteConnection::~SqliteConnection() = default;
 
 StoreExpected<std::unique_ptr<SqliteConnection>> SqliteConnection::open(const std::filesystem::path& path)
 {
+    // Without its accounts of memory, SQLite takes no lock for each allocation, which saves a tenth of the time of a
+    // row. It refuses this where it is in use already; nothing depends on it.
+    [[maybe_unused]] static const int configured = ::sqlite3_config(SQLITE_CONFIG_MEMSTATUS, 0);
     sqlite3* connection = nullptr;
     const int opened = ::sqlite3_open_v2(path.c_str(), &connection,
                                          SQLITE_OPEN_READWRITE | SQLITE_OPEN_CREATE | SQLITE_OPEN_NOMUTEX, nullptr);
