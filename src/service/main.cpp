@@ -1,5 +1,6 @@
 // kestod: puts the service object on the Linux platform and gives the main thread to the listener, until a signal ends
 // the process. It has no command line; the launch configuration is in the environment.
+#include "ledger/Report.h"
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/LinuxPlatform.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
@@ -8,6 +9,7 @@
 #include "service/KestoReportingServiceDelegate.h"
 #include "tracing/TraceRunner.h"
 #include "utility/EndProcess.h"
+#include "utility/KestoReportingUtility.h"
 #include "utility/LogCategories.h"
 
 #include <csignal>
@@ -75,6 +77,12 @@ int run()
     (*listener)->setEmitterAccess(platform.emitterAccess());
     const auto service = KestoReportingServiceDelegate::make();
     (*listener)->setDelegate(*service);
+    const ledger::ServiceProcess process{.version = KESTO_VERSION,
+                                         .isInternalBuild = KestoReportingUtilityIsInternalBuild(),
+                                         .started = platform.platform().clock.secondsSince1970()};
+    (*listener)->setStatus([&ledger = platform.platform().ledger, process](bool withCulprits) {
+        return ledger::report(ledger, process, withCulprits);
+    });
     (*listener)->setListeningHandler([] { platform::notifyReady("accepting connections"); });
     (*listener)->setStoppedHandler([&endSignals] { logEnd(*endSignals.request()); });
     endSignals.setHandlers({.begin = [&target = **listener] { target.stop(); },

@@ -6,7 +6,7 @@
 #include <CLI/Config.hpp>
 #include <CLI/Formatter.hpp>
 
-// Exit statuses; 2 is a wrong command line, 3 means incomplete results.
+// Exit statuses; 2 is a wrong command line, 3 means incomplete results. `kesto status` has some of its own.
 constexpr int exitOk = 0;
 constexpr int exitFailure = 1;
 constexpr int exitUsage = 2;
@@ -21,5 +21,6 @@ void addClientCommand(CLI::App& application, int& exitStatus);
 void addEventsCommand(CLI::App& application, int& exitStatus);
 void addNotifyCommand(CLI::App& application, int& exitStatus);
 void addPrefsCommand(CLI::App& application, int& exitStatus);
+void addStatusCommand(CLI::App& application, int& exitStatus);
 void addSummaryCommand(CLI::App& application, int& exitStatus);
 void addTraceCommand(CLI::App& application, int& exitStatus);

@@ -1,4 +1,4 @@
-// One rule for all three directories: only their names differ.
+// One rule for all directories: only their names differ.
 #include "kesto/ServiceDirectories.h"
 
 #include "platform/linux/process/Environment.h"
@@ -25,17 +25,36 @@ fs::path usualDirectory(const char* variable, std::initializer_list<fs::path> of
     return ofSystem;
 }
 
-} // namespace
-
-fs::path usualDatabase()
+// The file in the state directory.
+fs::path usualStateFile(const fs::path& name)
 {
-    const fs::path name = "analytics.sqlite3";
     const fs::path home = environment("HOME");
     // The last is the place of a user's service manager before version 254.
     return usualDirectory("STATE_DIRECTORY",
                           {fs::path(environment("XDG_STATE_HOME")) / "kesto", home / ".local/state/kesto",
                            fs::path(environment("XDG_CONFIG_HOME")) / "kesto", home / ".config/kesto"},
                           "/var/lib/kesto", name)
+        / name;
+}
+
+} // namespace
+
+fs::path usualDatabase()
+{
+    return usualStateFile("analytics.sqlite3");
+}
+
+fs::path usualLedger()
+{
+    return usualStateFile("analytics.ledger");
+}
+
+fs::path usualSocket()
+{
+    const fs::path name = "com.quarn.kesto.reporting";
+    if (const std::string given = environment("KESTO_SOCKET"); !given.empty())
+        return given;
+    return usualDirectory("RUNTIME_DIRECTORY", {fs::path(environment("XDG_RUNTIME_DIR")) / "kesto"}, "/run/kesto", name)
         / name;
 }
 

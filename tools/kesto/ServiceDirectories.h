@@ -6,6 +6,10 @@
 
 // $STATE_DIRECTORY/analytics.sqlite3
 [[nodiscard]] std::filesystem::path usualDatabase();
+// $STATE_DIRECTORY/analytics.ledger
+[[nodiscard]] std::filesystem::path usualLedger();
+// $KESTO_SOCKET, or that of the service in $RUNTIME_DIRECTORY
+[[nodiscard]] std::filesystem::path usualSocket();
 // $CONFIGURATION_DIRECTORY
 [[nodiscard]] std::filesystem::path usualConfigurationDirectory();
 // $LOGS_DIRECTORY

@@ -24,7 +24,7 @@ TEST_F(CommandLine, SaysItsVersion)
 TEST_F(CommandLine, HelpNamesEveryVerb)
 {
     const std::string help = tool.print({"--help"});
-    for (const char* verb : {"client", "events", "notify", "prefs", "summary", "trace"}) {
+    for (const char* verb : {"client", "events", "notify", "prefs", "status", "summary", "trace"}) {
         EXPECT_THAT(help, HasSubstr(verb));
         EXPECT_THAT(tool.print({verb, "--help"}), HasSubstr("Usage: kesto"));
     }
@@ -62,6 +62,9 @@ INSTANTIATE_TEST_SUITE_P(
         WrongArguments{"ATimeThatIsMalformed", {"events", "--since", "soon"}, "\"soon\" is not a time"},
         WrongArguments{"ANegativeCount", {"events", "--count", "-1"}, "--count"},
         WrongArguments{"ACountThatIsNotANumber", {"events", "--count", "few"}, "few"},
+        WrongArguments{"StatusAsTwoFormats", {"status", "--json", "--prometheus"}, "--prometheus"},
+        WrongArguments{"WatchedMetrics", {"status", "--watch", "--prometheus"}, "--prometheus"},
+        WrongArguments{"AnIntervalWithoutWatching", {"status", "--interval", "1"}, "--watch"},
         WrongArguments{"ANegativeWait", {"client", "--wait", "-1"}, "--wait"},
         WrongArguments{"PrefsWithoutAVerb", {"prefs"}, "subcommand is required"},
         WrongArguments{"PrefsWithAnUnknownVerb", {"prefs", "toggle", "a", "b"}, "toggle"},

@@ -51,8 +51,8 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
 
 TEST_F(Completion, NamesEveryOptionThatTheToolHas)
 {
-    for (const std::string verb : {"bugs", "channels", "client", "events", "summary", "notify", "trace", "trace record",
-                                   "prefs get", "prefs set", "prefs unset", "prefs list"}) {
+    for (const std::string verb : {"bugs", "channels", "client", "events", "status", "summary", "notify", "trace",
+                                   "trace record", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
         std::istringstream help(tool.runShell("$kesto " + verb + " --help").output);
         const auto offered = completions(verb + " --");
         for (std::string word; help >> word;)

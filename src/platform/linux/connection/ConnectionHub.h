@@ -1,12 +1,14 @@
 // What all connections of one listener share. It exists as long as the listener or one of its connections does.
 #pragma once
 
+#include "foundation/values/Value.h"
 #include "ledger/Ledger.h"
 #include "platform/Connection.h"
 #include "platform/Log.h"
 #include "platform/linux/files/FileDescriptor.h"
 
 #include <array>
+#include <functional>
 #include <thread>
 #include <vector>
 
@@ -21,6 +23,8 @@ struct ConnectionHub {
     LogCategory& log;
     ledger::Ledger& ledger;
     EmitterAccess* emitterAccess = nullptr; // null: no client can trace
+    // The answer to a client that asks for the status; the connection thread calls it.
+    std::function<foundation::Dictionary(bool withCulprits)> status = [](bool) { return foundation::Dictionary(); };
 
     std::thread::id connectionThread = {}; // from its start on
     [[nodiscard]] bool isConnectionThread() const { return connectionThread == std::this_thread::get_id(); }

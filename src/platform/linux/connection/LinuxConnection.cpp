@@ -3,6 +3,7 @@
 
 #include "foundation/cbor/Cbor.h"
 #include "platform/linux/connection/FrameReader.h"
+#include "platform/linux/connection/TrustedPeer.h"
 #include "platform/linux/files/SystemError.h"
 
 #include <cassert>
@@ -10,6 +11,7 @@
 #include <fmt/format.h>
 #include <sys/epoll.h>
 #include <sys/socket.h>
+#include <unistd.h>
 #include <utility>
 
 namespace platform {
@@ -24,14 +26,16 @@ constexpr std::uint64_t unansweredCall(std::size_t bytes) noexcept
     return std::uint64_t{1} << 32 | bytes;
 }
 
-// The one request beside the calls of the service's operations.
-bool asksForEmitterAccess(const foundation::Array& frame)
+// The requests beside the calls of the service's operations have names; of other frames the name is empty.
+std::string_view requestName(const foundation::Array& frame)
 {
-    if (frame.size() != 2)
-        return false;
-    const auto method = frame[1].string();
-    return method && method->view() == "trace";
+    return frame.size() == 2 ? frame[1].stringView() : std::string_view();
 }
+
+constexpr std::string_view emitterAccessRequest = "trace";
+constexpr std::string_view statusRequest = "status";
+
+const Connection::Violation wrongNumber{"a call's number is an unsigned 64-bit integer"};
 
 constexpr bool areTooManyUnanswered(std::uint64_t unanswered) noexcept
 {
@@ -92,6 +96,7 @@ bool LinuxConnection::handle(std::uint32_t events)
     }
     if ((events & ~EPOLLOUT) != 0 && ((events & endings) == 0 || !isBrokenOff()))
         read();
+    answerStatusRequest();
     return settle();
 }
 
@@ -178,8 +183,10 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
         if (!*frame)
             return {};
         auto& [array, size] = **frame;
-        if (asksForEmitterAccess(array)) {
-            if (auto asked = askForEmitterAccess(array[0]); !asked) {
+        if (const std::string_view request = requestName(array);
+            request == emitterAccessRequest || request == statusRequest) {
+            auto asked = request == statusRequest ? askForStatus(array[0], size) : askForEmitterAccess(array[0]);
+            if (!asked) {
                 hub_->ledger.count(Counter::FramesNotACall);
                 return asked;
             }
@@ -212,7 +219,7 @@ std::expected<void, Connection::Violation> LinuxConnection::askForEmitterAccess(
 {
     const auto number = call.exactly<std::uint64_t>();
     if (!number)
-        return std::unexpected(Violation{"a call's number is an unsigned 64-bit integer"});
+        return std::unexpected(wrongNumber);
     if (std::exchange(hasAskedForEmitterAccess_, true))
         return std::unexpected(Violation{"it asks for the trace marker twice"});
     hub_->ledger.count(Counter::CallsTrace);
@@ -233,12 +240,65 @@ void LinuxConnection::handOver(std::uint64_t call, const EmitterDescriptors& des
     foundation::appendCborInteger(call, frame);
     foundation::appendCborNull(frame);
     const foundation::Lock lock(lock_);
+    startOutput(frame, &descriptors);
+}
+
+// This request concerns what the service counted, so no turn of the server queue is needed for it either.
+std::expected<void, Connection::Violation> LinuxConnection::askForStatus(const foundation::Value& call,
+                                                                         std::size_t size)
+{
+    const auto number = call.exactly<std::uint64_t>();
+    if (!number)
+        return std::unexpected(wrongNumber);
+    hub_->ledger.count(Counter::CallsStatus);
+    unanswered_.fetch_add(unansweredCall(size));
+    const foundation::Lock lock(lock_);
+    statusRequests_.push_back({*number, size});
+    return {};
+}
+
+// Answers the oldest request, unless the socket has not taken the answers before it. The connection thread makes the
+// answer without the lock.
+void LinuxConnection::answerStatusRequest()
+{
+    StatusRequest request = {};
+    {
+        const foundation::Lock lock(lock_);
+        if (statusRequests_.empty() || !output_.empty())
+            return;
+        request = statusRequests_.front();
+        statusRequests_.pop_front();
+    }
+    std::string frame;
+    foundation::appendCborArrayHead(3, frame);
+    foundation::appendCborInteger(request.call, frame);
+    foundation::appendCborNull(frame);
+    foundation::appendCbor(hub_->status(mayKnowWhatOthersDid()), frame);
+    {
+        const foundation::Lock lock(lock_);
+        startOutput(frame, nullptr);
+    }
+    returnCredit(request.size);
+}
+
+bool LinuxConnection::mayKnowWhatOthersDid() const
+{
+    return isTrusted(peer_.userIdentifier, groupsOfPeer(socket_.get(), peer_.groupIdentifier), ::geteuid(),
+                     ::getegid());
+}
+
+// Sends a frame outside any turn.
+void LinuxConnection::startOutput(std::string_view frame, const EmitterDescriptors* descriptors)
+{
     if (isOver_ || breakReason_ || cannotSend_)
         return;
     std::string whole;
     appendFrame(frame, whole);
     unsentBytes_ += whole.size();
-    output_.append(std::move(whole), descriptors);
+    if (descriptors != nullptr)
+        output_.append(std::move(whole), *descriptors);
+    else
+        output_.append(std::move(whole));
     writeOutput();
 }
 
@@ -316,7 +376,7 @@ void LinuxConnection::watch()
     event.events = EPOLLRDHUP;
     if (!isBehind())
         event.events |= EPOLLIN;
-    if (!output_.empty())
+    if (!output_.empty() || !statusRequests_.empty())
         event.events |= EPOLLOUT;
     if (event.events == watchedEvents_)
         return;
@@ -348,6 +408,7 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
         if (isOver_)
             return;
         isOver_ = true;
+        statusRequests_.clear();
         drop(output_.drop());
         readingPauses = readingPauses_;
         if (isResumed_) // closing is not enough while a child process holds a copy

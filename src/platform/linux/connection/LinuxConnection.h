@@ -4,6 +4,9 @@
 // frames, decodes them, and delivers their calls immediately. Any thread writes: it tries the socket itself. Only what
 // a slow peer does not take waits until the connection thread finds room in the socket again.
 //
+// A client may ask for the status as often as it likes: a connection makes one answer in each pass of the connection
+// thread, and only when the socket has taken the one before. The other requests wait; they count as unanswered calls.
+//
 // Every client is treated as hostile. If one breaks the protocol, its own connection ends, with one line in the log. If
 // it asks faster than it gets answers, or does not read its answers, the connection stops reading from it until it is
 // less behind; if even then far too many answers are unread, the connection ends. At the end the log says what this
@@ -19,10 +22,13 @@
 #include "platform/linux/trace/EmitterAccess.h"
 
 #include <atomic>
+#include <cstddef>
 #include <cstdint>
+#include <deque>
 #include <memory>
 #include <optional>
 #include <string>
+#include <string_view>
 
 namespace platform {
 
@@ -40,6 +46,7 @@ public:
     struct Peer {
         std::int32_t processIdentifier = 0;
         std::uint32_t userIdentifier = 0;
+        std::uint32_t groupIdentifier = 0; // its primary group
     };
 
     // The socket is connected and non-blocking.
@@ -67,6 +74,10 @@ public:
 
 private:
     class Credit;
+    struct StatusRequest {
+        std::uint64_t call;
+        std::size_t size; // of its frame
+    };
 
     [[nodiscard]] bool isBrokenOff();
     [[nodiscard]] bool settle();
@@ -77,9 +88,13 @@ private:
     [[nodiscard]] std::expected<void, Violation> deliverCalls();
     [[nodiscard]] std::expected<void, Violation> askForEmitterAccess(const foundation::Value& call);
     void handOver(std::uint64_t call, const EmitterDescriptors& descriptors);
+    [[nodiscard]] std::expected<void, Violation> askForStatus(const foundation::Value& call, std::size_t size);
+    void answerStatusRequest();
+    [[nodiscard]] bool mayKnowWhatOthersDid() const;
     void breakOff(std::string reason);
     void end(std::optional<std::string> interruptedBecause);
 
+    void startOutput(std::string_view frame, const EmitterDescriptors* descriptors) KESTO_REQUIRES(lock_);
     void returnCredit(std::size_t bytes);
     [[nodiscard]] bool isBehind() const noexcept;
     void drop(std::size_t bytes);
@@ -106,6 +121,7 @@ private:
     foundation::Mutex lock_;
     FileDescriptor socket_; // read without the lock: only the connection thread closes it, under the lock
     ConnectionOutput output_ KESTO_GUARDED_BY(lock_); // what the socket has not accepted yet
+    std::deque<StatusRequest> statusRequests_ KESTO_GUARDED_BY(lock_); // not answered yet
     std::uint32_t watchedEvents_ KESTO_GUARDED_BY(lock_) = 0;
     std::uint64_t readingPauses_ KESTO_GUARDED_BY(lock_) = 0;
     std::optional<std::string> breakReason_ KESTO_GUARDED_BY(lock_);

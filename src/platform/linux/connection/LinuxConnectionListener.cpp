@@ -169,7 +169,7 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     }
     ++user.connections;
     const auto connection =
-        std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid});
+        std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid, peer.gid});
     connections_.emplace(connection.get(), connection);
     hub_->ledger.count(ledger::Counter::ConnectionsAccepted);
     if (!delegate_->shouldAcceptNewConnection(*this, connection))

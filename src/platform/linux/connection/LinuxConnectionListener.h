@@ -1,6 +1,6 @@
 // The room of connections: the socket of the service, its clients' connections, and the frames that they exchange. It
-// uses sockets and epoll. It hands calls to a queue, and the trace's marker and switch page to clients that ask. It
-// does not know what a call means or what the service does with it.
+// uses sockets and epoll. It hands calls to a queue, and the trace's marker and switch page, or the status, to clients
+// that ask. It does not know what a call or a status means or what the service does with it.
 //
 // The listener accepts the connections of the service's socket. The thread that resumes it is the connection thread of
 // all of them: it waits for all sockets together, and wakes for nothing else.
@@ -47,6 +47,12 @@ public:
     void setDelegate(ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
     // Gives the trace's marker and switch page to clients that ask. Call this before `resume`.
     void setEmitterAccess(EmitterAccess& access) { hub_->emitterAccess = &access; }
+    // Makes the answers to clients that ask for the status: with culprits for those that may know what others did. The
+    // connection thread calls it, so it must not wait. Call this before `resume`.
+    void setStatus(std::function<foundation::Dictionary(bool withCulprits)> status)
+    {
+        hub_->status = std::move(status);
+    }
     // `resume` calls the handler once, as soon as new clients are served. Call this before `resume`.
     void setListeningHandler(std::move_only_function<void()> handler) { listeningHandler_ = std::move(handler); }
     // `resume` calls the handler once, when it has been stopped, before it ends the connections. The same.

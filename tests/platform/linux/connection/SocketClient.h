@@ -82,20 +82,27 @@ public:
         return count < 0 ? 0 : static_cast<std::size_t>(count);
     }
 
-    // The first number of the next frame; nothing if the service closed or reset the connection.
-    std::optional<int> readNumber()
+    // The next frame; nothing if the service closed or reset the connection.
+    std::optional<foundation::Array> readFrame()
     {
         while (true) {
             const auto frame = reader_.next();
             if (!frame)
                 throw std::runtime_error("the service sent a frame that is too long");
-            if (*frame) {
-                const auto value = decoder_.decode(**frame);
-                return static_cast<int>((*value->array())[0].number()->int64Value());
-            }
+            if (*frame)
+                return decoder_.decode(**frame)->array();
             if (!readMore())
                 return std::nullopt;
         }
+    }
+
+    // The first number of the next frame; nothing at the end.
+    std::optional<int> readNumber()
+    {
+        const auto frame = readFrame();
+        if (!frame)
+            return std::nullopt;
+        return static_cast<int>((*frame)[0].number()->int64Value());
     }
 
     // The numbers of so many frames.
