@@ -13,8 +13,9 @@ bool isTrusted(uid_t user, std::span<const gid_t> groups, uid_t ownUser, gid_t o
 
 std::vector<gid_t> groupsOfPeer(int socket, gid_t primaryGroup)
 {
+    gid_t first = 0;
     socklen_t size = 0;
-    ::getsockopt(socket, SOL_SOCKET, SO_PEERGROUPS, nullptr, &size);
+    ::getsockopt(socket, SOL_SOCKET, SO_PEERGROUPS, &first, &size);
     std::vector<gid_t> groups(size / sizeof(gid_t));
     if (::getsockopt(socket, SOL_SOCKET, SO_PEERGROUPS, groups.data(), &size) != 0)
         groups.clear();
