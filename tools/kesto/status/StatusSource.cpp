@@ -38,6 +38,8 @@ bool StatusSource::isConnected()
         throw noAnswer("the path is too long for a socket");
     socket_.native().copy(address.sun_path, sizeof address.sun_path - 1);
     connection_ = platform::FileDescriptor(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    if (!connection_)
+        throw systemFailure();
     constexpr timeval longestWait{.tv_sec = 10, .tv_usec = 0};
     ::setsockopt(connection_.get(), SOL_SOCKET, SO_RCVTIMEO, &longestWait, sizeof longestWait);
     ::setsockopt(connection_.get(), SOL_SOCKET, SO_SNDTIMEO, &longestWait, sizeof longestWait);

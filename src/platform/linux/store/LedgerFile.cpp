@@ -38,11 +38,12 @@ LedgerFile::LedgerFile(const std::filesystem::path& directory, const Clock& cloc
 
 std::expected<LedgerFile::Mapping, std::error_code> LedgerFile::open()
 {
-    file_ = FileDescriptor(::open(path_.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW));
-    if (!file_ && errno != ENOENT)
+    const int descriptor = ::open(path_.c_str(), O_RDWR | O_CLOEXEC | O_NOFOLLOW);
+    if (descriptor < 0 && errno != ENOENT)
         return std::unexpected(systemError());
-    if (!file_)
+    if (descriptor < 0)
         return replaceFile(earlier_);
+    file_ = FileDescriptor(descriptor);
     if (::flock(file_.get(), LOCK_EX | LOCK_NB) != 0)
         return std::unexpected(systemError());
     struct stat status = {};
