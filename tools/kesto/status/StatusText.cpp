@@ -149,8 +149,9 @@ private:
         if (!who)
             return;
         bool isFirst = true;
-        for (const auto& [charge, list] : *who)
-            for (const Value& each : *list.array()) {
+        for (const auto& [charge, list] : *who) {
+            const foundation::Array culprits = list.array().value_or(foundation::Array());
+            for (const Value& each : culprits) {
                 if (std::exchange(isFirst, false)) {
                     text_ += '\n';
                     addCulprit("BY WHOM", "USER", "COUNT", "PROCESS", "APPLICATION");
@@ -163,6 +164,7 @@ private:
                 else
                     addCulprit(charge.view(), "-", count, "all others", "");
             }
+        }
     }
 
     void addCulprit(std::string_view charge, std::string_view user, std::string_view count, std::string_view process,
