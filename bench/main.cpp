@@ -29,6 +29,7 @@ constexpr std::array groups{
     MeasurementGroup{"end", "the end of a session of a million messages", measureSessionEnd},
     MeasurementGroup{"ended", "the memory that stays of sessions that ended", measureEndedSessions},
     MeasurementGroup{"starving", "what others wait while a long session ends", measureLongStop},
+    MeasurementGroup{"status", "what a client waits for the status of a busy service", measureStatusRequest},
     MeasurementGroup{"lookup", "finding a session among 10,000 clients", measureLookup},
     MeasurementGroup{"notification", "telling all sessions that a setting changed", measureNotification},
     MeasurementGroup{"idle", "wake-ups and memory with nothing to do", measureIdle},

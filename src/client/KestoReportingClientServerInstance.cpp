@@ -136,7 +136,7 @@ void KestoReportingClientServerInstance::removeSession(platform::Turn& turn, std
 
 void KestoReportingClientServerInstance::createReportingSession(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
+    submitLong([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "creating session for reporter {}", reporterID);
         utility::emitTraceCode(utility::ServiceTraceCode::ClientCreate);
         const bool replaces = self.clientReportingSessionMap_.find(reporterID) != nullptr;
@@ -209,7 +209,7 @@ void KestoReportingClientServerInstance::setConfiguration(foundation::Dictionary
 
 void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
+    submitLong([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "starting session for reporter {}", reporterID);
         utility::emitTraceCode(utility::ServiceTraceCode::ClientStart);
         const auto delegate = self.delegate_.lock();
@@ -238,7 +238,7 @@ void KestoReportingClientServerInstance::start(platform::Turn& turn, KestoReport
 
 void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
+    submitLong([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "stopping session for reporter {}", reporterID);
         utility::emitTraceCode(utility::ServiceTraceCode::ClientStop);
         if (reporterID == 0)
@@ -266,7 +266,7 @@ void KestoReportingClientServerInstance::stop(platform::Turn& turn, KestoReporti
 
 void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID, SuccessReply reply)
 {
-    submit([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
+    submitLong([reporterID, reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "destroying session for reporter {}", reporterID);
         utility::emitTraceCode(utility::ServiceTraceCode::ClientDestroy);
         if (reporterID == 0)
@@ -296,7 +296,7 @@ void KestoReportingClientServerInstance::reporterID(std::int64_t reporterID, Dic
 
 void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
 {
-    submit([reply = std::move(reply)](auto& self, platform::Turn& turn) {
+    submitLong([reply = std::move(reply)](auto& self, platform::Turn& turn) {
         if (self.isConnectionLost_) // the calls that it left waiting must not delay others
             return;
         std::vector<foundation::Value> reporterIDs;
@@ -323,7 +323,7 @@ void KestoReportingClientServerInstance::killService(SuccessReply)
 void KestoReportingClientServerInstance::handleConnectionError()
 {
     isConnectionLost_ = true;
-    submit([](auto& self, platform::Turn& turn) {
+    submitLong([](auto& self, platform::Turn& turn) {
         const auto delegate = self.delegate_.lock();
         if (!delegate || !isRegistered(*delegate, self))
             return;

@@ -92,6 +92,12 @@ private:
         utility::serverQueue()->submit(
             [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
     }
+    // The same for work that takes long with many messages, sessions or channels.
+    template <typename Work> void submitLong(Work work)
+    {
+        utility::serverQueue()->submitLong(
+            [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
+    }
     static void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
                       const SuccessReply& reply);
     static void stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session);

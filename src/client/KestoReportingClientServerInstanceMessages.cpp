@@ -25,9 +25,11 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
     const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
     const std::uint32_t user = caller != nullptr ? caller->userIdentifier() : userIdentifier_;
     auto processName = KestoReportingUtilityProcessNameForPID(sender);
-    submit([message = Message{std::move(message), category, type, sender, user,
-                              std::move(processName).value_or("(null)"), source_},
-            reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
+    constexpr std::size_t fewReceivers = 16;
+    const bool mayTakeLong = !reporterIDs || reporterIDs->size() > fewReceivers;
+    auto deliver = [message = Message{std::move(message), category, type, sender, user,
+                                      std::move(processName).value_or("(null)"), source_},
+                    reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
                   reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
         utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
@@ -41,7 +43,11 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
         else
             self.deliverToActiveSessions(turn, *delegate, message);
         reply(turn, std::nullopt);
-    });
+    };
+    if (mayTakeLong)
+        submitLong(std::move(deliver));
+    else
+        submit(std::move(deliver));
 }
 
 void KestoReportingClientServerInstance::deliverToReporters(platform::Turn& turn,

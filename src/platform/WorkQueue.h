@@ -23,6 +23,7 @@
 #include <functional>
 #include <memory>
 #include <string_view>
+#include <utility>
 
 namespace platform {
 
@@ -51,6 +52,9 @@ class TurnQueue : public WorkQueue {
 public:
     using WorkQueue::submit;
     virtual void submit(TurnItem item) = 0;
+    // The same for an item that may take longer than a millisecond: no helper runs it, because a helper has other
+    // things to do, too.
+    virtual void submitLong(TurnItem item) { submit(std::move(item)); }
 };
 
 // How a serial queue is run.

@@ -7,6 +7,7 @@
 #include "platform/linux/process/EndSignals.h"
 #include "platform/linux/process/ServiceManager.h"
 #include "service/KestoReportingServiceDelegate.h"
+#include "service/StatusNotifier.h"
 #include "tracing/TraceRunner.h"
 #include "utility/EndProcess.h"
 #include "utility/KestoReportingUtility.h"
@@ -84,6 +85,9 @@ int run()
         return ledger::report(ledger, process, withCulprits);
     });
     (*listener)->setListeningHandler([] { platform::notifyReady("accepting connections"); });
+    if (platform::hasServiceManager())
+        service::StatusNotifier::start(platform.platform().ledger, platform.platform().clock,
+                                       platform.platform().workQueues, process, platform::notifyStatus);
     (*listener)->setStoppedHandler([&endSignals] { logEnd(*endSignals.request()); });
     endSignals.setHandlers({.begin = [&target = **listener] { target.stop(); },
                             .giveUp =

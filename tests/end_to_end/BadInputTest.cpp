@@ -89,6 +89,8 @@ INSTANTIATE_TEST_SUITE_P(
         BadInput{"MethodZero", [](WireClient& client) { client.sendFrame(Array{1, 0}); }, "unknown method 0"},
         BadInput{"ACallWithoutAMethod", [](WireClient& client) { client.sendFrame(Array{1}); }, "a call is an array"},
         BadInput{"ANegativeCallNumber", [](WireClient& client) { client.sendFrame(Array{-1, 10}); }, "a call's number"},
+        BadInput{"ARequestForTheStatusWithAWrongNumber",
+                 [](WireClient& client) { client.sendFrame(Array{-1, "status"}); }, "a call's number"},
         BadInput{"TooFewArguments", [](WireClient& client) { client.sendFrame(Array{1, 1}); },
                  "createReportingSession takes 1 arguments, not 0"},
         BadInput{"TooManyArguments", [](WireClient& client) { client.sendFrame(Array{1, 10, 1}); },

@@ -323,8 +323,18 @@ TEST_F(ServiceManagerTest, IsNotifiedEachTime)
     EXPECT_EQ(received(), "READY=1\nSTATUS=accepting connections again");
 }
 
+TEST_F(ServiceManagerTest, ShowsTheLastStatus)
+{
+    EXPECT_FALSE(hasServiceManager());
+    listen();
+    EXPECT_TRUE(hasServiceManager());
+    notifyStatus("3 connections, 100% kept");
+    EXPECT_EQ(received(), "STATUS=3 connections, 100% kept");
+}
+
 TEST_F(ServiceManagerTest, WithoutOneNothingHappens)
 {
+    notifyStatus("3 connections");
     notifyReady("accepting connections");
     set("NOTIFY_SOCKET", root / "nobody");
     notifyReady("accepting connections");

@@ -252,6 +252,7 @@ std::expected<void, Connection::Violation> LinuxConnection::askForStatus(const f
         return std::unexpected(wrongNumber);
     hub_->ledger.count(Counter::CallsStatus);
     unanswered_.fetch_add(unansweredCall(size));
+    awaitsStatus_ = true;
     const foundation::Lock lock(lock_);
     statusRequests_.push_back({*number, size});
     return {};
@@ -261,6 +262,8 @@ std::expected<void, Connection::Violation> LinuxConnection::askForStatus(const f
 // answer without the lock.
 void LinuxConnection::answerStatusRequest()
 {
+    if (!awaitsStatus_)
+        return;
     StatusRequest request = {};
     {
         const foundation::Lock lock(lock_);
@@ -268,6 +271,7 @@ void LinuxConnection::answerStatusRequest()
             return;
         request = statusRequests_.front();
         statusRequests_.pop_front();
+        awaitsStatus_ = !statusRequests_.empty();
     }
     std::string frame;
     foundation::appendCborArrayHead(3, frame);

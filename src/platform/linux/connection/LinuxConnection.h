@@ -112,6 +112,7 @@ private:
     bool peerIsDone_ = false; // it closed its side between two frames
     bool isFinishing_ = false; // by the service: a frame that is cut short is not the peer's fault
     bool hasAskedForEmitterAccess_ = false;
+    bool awaitsStatus_ = false; // a request waits, so that other connections need no lock to find none
 
     // How far the client is behind.
     std::atomic<std::uint64_t> unanswered_; // calls in the upper half, their bytes in the lower half

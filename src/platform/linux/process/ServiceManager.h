@@ -10,5 +10,9 @@ namespace platform {
 void notifyReady(const std::string& status);
 // Reports that the service ends. The same.
 void notifyStopping(const std::string& status);
+// Replaces that line. The same.
+void notifyStatus(const std::string& status);
+// Whether a service manager wants to be notified. The same.
+[[nodiscard]] bool hasServiceManager();
 
 } // namespace platform

@@ -9,7 +9,10 @@
 #include "platform/linux/queues/DelayedWork.h"
 #include "platform/linux/queues/SerialQueue.h"
 
+#include <chrono>
+#include <functional>
 #include <memory>
+#include <utility>
 #include <vector>
 
 namespace platform {
@@ -17,9 +20,18 @@ namespace platform {
 // Any thread. A serial queue lives as long as its owner keeps it, even longer than this.
 class LinuxWorkQueues final : public WorkQueues {
 public:
-    // The handler takes what each turn of a turn queue has gathered, on the thread that ran the turn. Set it before the
-    // first turn queue is made.
-    void setTurnEndHandler(SerialQueue::TurnEndHandler handler) { turnEndHandler_ = std::move(handler); }
+    // A helper of its queues begins no further item after so long.
+    explicit LinuxWorkQueues(std::chrono::nanoseconds longestHelp = SerialQueue::longestHelp)
+        : longestHelp_(longestHelp)
+    {
+    }
+
+    // The handler takes what each turn of a turn queue has gathered (see SerialQueue). Set it before the first turn
+    // queue is made.
+    void setTurnEndHandler(SerialQueue::TurnEndHandler handler, std::function<bool()> wouldWait = nullptr)
+    {
+        turnEnd_ = {.handler = std::move(handler), .wouldWait = std::move(wouldWait)};
+    }
 
     [[nodiscard]] std::shared_ptr<WorkQueue> makeSerialQueue(std::string_view name,
                                                              SerialQueueOptions options) override;
@@ -40,7 +52,8 @@ public:
 private:
     [[nodiscard]] std::vector<std::shared_ptr<SerialQueue>> livingTurnQueues() const;
 
-    SerialQueue::TurnEndHandler turnEndHandler_;
+    const std::chrono::nanoseconds longestHelp_;
+    SerialQueue::TurnEnd turnEnd_;
     mutable foundation::Mutex lock_;
     std::vector<std::weak_ptr<SerialQueue>> turnQueues_ KESTO_GUARDED_BY(lock_);
     BackgroundQueue backgroundQueue_;

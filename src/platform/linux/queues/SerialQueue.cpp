@@ -1,5 +1,5 @@
-// The queue's thread and helpers alike take a turn, run it, and give it back. Three flags under one lock coordinate
-// them.
+// The queue's thread and helpers alike take a turn, run it, and give it back; a helper may leave the rest of it to the
+// queue's thread. Four flags under one lock coordinate them.
 #include "platform/linux/queues/SerialQueue.h"
 
 #include "foundation/Mutex.h"
@@ -15,21 +15,22 @@ namespace platform {
 
 class SerialQueue::Work : public std::enable_shared_from_this<Work> {
 public:
-    Work(TurnEndHandler turnEndHandler, bool mayBeHelped)
-        : turnEndHandler_(std::move(turnEndHandler)),
-          mayBeHelped_(mayBeHelped)
+    Work(TurnEnd turnEnd, bool mayBeHelped, std::chrono::nanoseconds helpFor)
+        : turnEnd_(std::move(turnEnd)),
+          mayBeHelped_(mayBeHelped),
+          longestHelp_(helpFor)
     {
     }
 
-    void add(TurnItem item)
+    void add(TurnItem item, bool mayTakeLong = false)
     {
         assert(!mayBeHelped_ || !thisThread.isHelper || !foundation::Lock::isAnyHeld());
         const bool mayHelp = mayBeHelped_ && thisThread.mayHelp(this);
         if (mayHelp && thisThread.toHelp == nullptr)
             thisThread.toHelp = shared_from_this();
         const foundation::Lock lock(lock_);
-        waiting_.push_back(std::move(item));
-        const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith;
+        waiting_.push_back({std::move(item), mayTakeLong});
+        const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith && !mayTakeLong;
         if (!isTurnTaken_ && !isLeftToHelper)
             wakeThread(); // under the lock: after it, the item may destroy the queue
     }
@@ -65,7 +66,7 @@ public:
                 return;
             takeTurn();
         }
-        runTurn();
+        runTurnAsHelper();
     }
 
     [[nodiscard]] bool isCurrent() const noexcept { return thisThread.runs == this; }
@@ -97,7 +98,14 @@ public:
     static thread_local ThisThread thisThread;
 
 private:
+    using Clock = std::chrono::steady_clock;
+
     static constexpr std::size_t mostRoomKept = 1024; // in items; further room of a burst is freed
+
+    struct Item {
+        TurnItem run;
+        bool mayTakeLong = false;
+    };
 
     // What the queue's thread does next.
     enum class Next : std::uint8_t { Turn, Heap, End };
@@ -106,6 +114,8 @@ private:
     {
         const foundation::Lock lock(lock_);
         while (waiting_.empty() || isTurnTaken_) {
+            if (std::exchange(isTurnLeft_, false))
+                return Next::Turn;
             if (isEnding_ && !isTurnTaken_)
                 return Next::End;
             if (heap.isAsked())
@@ -130,20 +140,62 @@ private:
         itemsOfTurn_ = items_.size();
     }
 
+    // Runs what is left of the turn.
     void runTurn()
     {
         thisThread.runs = this;
-        for (TurnItem& item : items_) {
-            item(turn_);
-            item = nullptr; // what it holds is released before the next one runs
+        while (ran_ < items_.size())
+            runNext();
+        endTurn();
+    }
+
+    // Whether to read the clock, which costs some hundredths of what an item does: not before the first item, which
+    // begins at once, and not before each of the others.
+    [[nodiscard]] static bool isTimeToLook(std::size_t ran) noexcept
+    {
+        constexpr std::size_t itemsBetween = 8;
+        return ran % itemsBetween == 1;
+    }
+
+    void runTurnAsHelper()
+    {
+        thisThread.runs = this;
+        const auto end = items_.size() > 1 ? Clock::now() + longestHelp_ : Clock::time_point::max();
+        while (ran_ < items_.size()) {
+            if (items_[ran_].mayTakeLong || (isTimeToLook(ran_) && Clock::now() >= end))
+                return leaveTurn();
+            runNext();
         }
+        if (turnEnd_.wouldWait && turnEnd_.wouldWait())
+            return leaveTurn();
+        endTurn();
+    }
+
+    void runNext()
+    {
+        TurnItem& item = items_[ran_++].run;
+        item(turn_);
+        item = nullptr; // what it holds is released before the next one runs
+    }
+
+    void endTurn()
+    {
         items_.clear();
+        ran_ = 0;
         if (items_.capacity() > mostRoomKept)
-            items_ = std::vector<TurnItem>();
-        if (turnEndHandler_)
-            turnEndHandler_(turn_);
+            items_ = std::vector<Item>();
+        if (turnEnd_.handler)
+            turnEnd_.handler(turn_);
         thisThread.runs = nullptr;
         giveTurnBack();
+    }
+
+    void leaveTurn()
+    {
+        thisThread.runs = nullptr;
+        const foundation::Lock lock(lock_);
+        isTurnLeft_ = true;
+        wakeThread();
     }
 
     void giveTurnBack()
@@ -157,24 +209,28 @@ private:
             finished_.notifyAll();
     }
 
-    const TurnEndHandler turnEndHandler_;
+    const TurnEnd turnEnd_;
     const bool mayBeHelped_;
+    const std::chrono::nanoseconds longestHelp_;
     foundation::Mutex lock_;
     foundation::Condition changed_;
     foundation::Condition finished_; // nothing waits or runs
-    std::vector<TurnItem> waiting_ KESTO_GUARDED_BY(lock_);
-    std::vector<TurnItem> items_; // `items_` and `turn_` belong to the thread that has taken the turn
+    std::vector<Item> waiting_ KESTO_GUARDED_BY(lock_);
+    std::vector<Item> items_; // this, `ran_` and `turn_` belong to the thread that has taken the turn
+    std::size_t ran_ = 0; // of the items
     Turn turn_;
     std::size_t itemsOfTurn_ KESTO_GUARDED_BY(lock_) = 0;
     bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // a thread is running one
+    bool isTurnLeft_ KESTO_GUARDED_BY(lock_) = false; // by a helper, for the queue's thread
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread sleeps, and has not been woken yet
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
 };
 
 thread_local SerialQueue::Work::ThisThread SerialQueue::Work::thisThread;
 
-SerialQueue::SerialQueue(std::string_view name, SerialQueueOptions options, TurnEndHandler turnEndHandler)
-    : work_(std::make_shared<Work>(std::move(turnEndHandler), options.mayBeHelped)),
+SerialQueue::SerialQueue(std::string_view name, SerialQueueOptions options, TurnEnd turnEnd,
+                         std::chrono::nanoseconds helpFor)
+    : work_(std::make_shared<Work>(std::move(turnEnd), options.mayBeHelped, helpFor)),
       thread_(startThread(name, options.quality, [work = work_] { work->run(); }))
 {
 }
@@ -196,6 +252,12 @@ void SerialQueue::submit(WorkItem item)
 void SerialQueue::submit(TurnItem item)
 {
     work_->add(std::move(item));
+}
+
+void SerialQueue::submitLong(TurnItem item)
+{
+    constexpr bool mayTakeLong = true;
+    work_->add(std::move(item), mayTakeLong);
 }
 
 bool SerialQueue::isCurrent() const

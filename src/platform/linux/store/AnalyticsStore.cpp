@@ -111,6 +111,13 @@ void AnalyticsStore::endTurn(Turn& turn, WhenKept whenKept)
         whenKept();
 }
 
+bool AnalyticsStore::isFillingUp()
+{
+    const foundation::Lock lock(lock_);
+    return waiting_.events.size() + waiting_.whenKept.size() > limits_.mostEvents / 2
+        || waiting_.events.bytes() > limits_.mostBytes / 2;
+}
+
 void AnalyticsStore::flush()
 {
     std::promise<void> kept;

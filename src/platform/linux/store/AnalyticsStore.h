@@ -72,6 +72,9 @@ public:
     // much waits to be written.
     void endTurn(Turn& turn, WhenKept whenKept);
 
+    // Whether more than half of what may wait for the store's thread does, so that the end of a turn may block soon.
+    [[nodiscard]] bool isFillingUp();
+
     // Returns when everything taken so far is committed or counted as lost.
     void flush();
     // For a process that ends now: counts the events taken that are neither as lost, and returns their number. Never

@@ -15,6 +15,7 @@
 #include <future>
 #include <gtest/gtest.h>
 #include <latch>
+#include <optional>
 #include <pthread.h>
 #include <set>
 #include <string>
@@ -44,7 +45,7 @@ protected:
         done->wait();
     }
 
-    LinuxWorkQueues queues;
+    LinuxWorkQueues queues{24h}; // helpers run whole turns, however slow the machine is
 };
 
 std::string nameOfThisThread()
@@ -248,6 +249,109 @@ TEST_F(TurnsTest, AHelperRunsATurnItselfWithItsEnd)
     submit(3);
     helper.help();
     EXPECT_EQ(history, (std::vector<int>{1, 2, 0, 3, 0}));
+}
+
+// What a helper leaves to the queue's thread.
+class LeftTurnsTest : public testing::Test {
+protected:
+    std::shared_ptr<TurnQueue> makeQueue(std::chrono::nanoseconds longestHelp, bool wouldWait)
+    {
+        queues.emplace(longestHelp);
+        queues->setTurnEndHandler([this](Turn&) { note("end"); }, [wouldWait] { return wouldWait; });
+        return queues->makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
+    }
+    void note(const std::string& event)
+    {
+        history.push_back(event + (std::this_thread::get_id() == helperThread ? " helped" : ""));
+    }
+
+    const std::thread::id helperThread = std::this_thread::get_id();
+    std::vector<std::string> history;
+    std::optional<LinuxWorkQueues> queues;
+};
+
+TEST_F(LeftTurnsTest, AHelperLeavesTheRestWhenItHasHelpedForLongEnough)
+{
+    auto queue = makeQueue(0ns, false);
+    SerialQueue::Helper helper;
+    queue->submit([&] { note("first"); });
+    queue->submit([&] { note("second"); });
+    queue->submit([&] { note("third"); });
+    helper.help();
+    queue.reset();
+    EXPECT_EQ(history, (std::vector<std::string>{"first helped", "second", "third", "end"}));
+}
+
+TEST_F(LeftTurnsTest, AHelperRunsASingleItemHoweverShortItMayHelp)
+{
+    auto queue = makeQueue(0ns, false);
+    SerialQueue::Helper helper;
+    queue->submit([&] { note("first"); });
+    helper.help();
+    queue->submit([&] { note("second"); });
+    helper.help();
+    queue.reset();
+    EXPECT_EQ(history, (std::vector<std::string>{"first helped", "end helped", "second helped", "end helped"}));
+}
+
+TEST_F(LeftTurnsTest, AHelperLeavesTheEndIfThatWouldWait)
+{
+    auto queue = makeQueue(24h, true);
+    SerialQueue::Helper helper;
+    queue->submit([&] { note("first"); });
+    queue->submit([&] { note("second"); });
+    helper.help();
+    queue.reset();
+    EXPECT_EQ(history, (std::vector<std::string>{"first helped", "second helped", "end"}));
+}
+
+TEST_F(LeftTurnsTest, NoHelperRunsAnItemThatMayTakeLong)
+{
+    constexpr int rounds = 200; // because the queue's thread may be faster than the helper
+    auto queue = makeQueue(24h, false);
+    {
+        SerialQueue::Helper helper;
+        for (int round = 0; round < rounds; ++round) {
+            queue->submit([&] { note("short"); });
+            queue->submitLong([&](Turn&) { note("long"); });
+            queue->submit([&] { note("short"); });
+            helper.help();
+        }
+    }
+    queue.reset();
+    EXPECT_EQ(std::ranges::count(history, "long"), rounds);
+    EXPECT_FALSE(std::ranges::count(history, "long helped"));
+    std::erase_if(history, [](const std::string& event) { return event.starts_with("end"); });
+    for (std::size_t place = 0; place < history.size(); ++place)
+        EXPECT_EQ(history[place].starts_with("long"), place % 3 == 1) << "they keep their order";
+}
+
+TEST_F(LeftTurnsTest, AnItemThatMayTakeLongDoesNotWaitForHelp)
+{
+    auto queue = makeQueue(24h, false);
+    const auto done = queues->makeSemaphore(0);
+    const SerialQueue::Helper helper;
+    queue->submitLong([&](Turn&) { done->signal(); });
+    done->wait();
+    queue.reset();
+}
+
+TEST_F(LeftTurnsTest, WhatIsSubmittedWhileATurnIsLeftComesBehindIt)
+{
+    constexpr int items = 3000;
+    auto queue = makeQueue(0ns, false);
+    std::vector<int> ran;
+    {
+        SerialQueue::Helper helper;
+        for (int item = 0; item < items; ++item) {
+            queue->submit([&ran, item] { ran.push_back(item); });
+            if (item % 5 == 4)
+                helper.help();
+        }
+    }
+    queue.reset();
+    EXPECT_EQ(ran.size(), 3000U);
+    EXPECT_TRUE(std::ranges::is_sorted(ran));
 }
 
 TEST_F(TurnsTest, AHelpedTurnIsTheQueues)

@@ -389,6 +389,21 @@ TEST_F(AnalyticsStoreTest, TooManyEventsMakeTheSenderWaitUntilThereIsRoom)
     EXPECT_EQ(storedEvents(), 101);
 }
 
+TEST_F(AnalyticsStoreTest, FillsUpWhenHalfOfTheRoomIsTaken)
+{
+    limits = {.mostEvents = 10, .mostBytes = 1 << 20};
+    {
+        Hold hold(store());
+        for (int number = 0; number < 5; ++number)
+            send(number);
+        EXPECT_FALSE(store().isFillingUp());
+        send(5);
+        EXPECT_TRUE(store().isFillingUp());
+    }
+    store().flush();
+    EXPECT_FALSE(store().isFillingUp());
+}
+
 TEST_F(AnalyticsStoreTest, TooManyBytesMakeTheEndOfATurnWait)
 {
     limits = {.mostEvents = 1000, .mostBytes = 100'000};
