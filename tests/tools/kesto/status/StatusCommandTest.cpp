@@ -167,6 +167,7 @@ TEST_F(StatusCommand, WithoutTheServiceAndItsLedgerSaysSo)
 TEST_F(StatusCommand, OfALedgerThatIsDamagedOrOfAnotherVersionSaysSo)
 {
     kestod.startAndAwait();
+    static_cast<void>(use()); // the service listens before its ledger is there
     kestod.kill();
     const auto expectRefusal = [&](const char* what) {
         SCOPED_TRACE(what);
