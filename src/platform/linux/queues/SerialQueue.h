@@ -41,7 +41,7 @@ public:
         TurnEndHandler handler; // takes what the turn gathered, on the thread that ran the turn or its last part
         std::function<bool()> wouldWait; // whether the handler would now make its thread wait for another
     };
-    SerialQueue(std::string_view name, SerialQueueOptions options, TurnEnd turnEnd,
+    SerialQueue(std::string_view name, SerialQueueOptions options, TurnEnd turnEnd = {},
                 std::chrono::nanoseconds helpFor = longestHelp);
     // Waits until all submitted items have run. If one of the queue's own items destroys the queue, this does not wait,
     // and the thread ends later.
