@@ -52,6 +52,7 @@ constexpr std::array<CounterRow, counterCount> makeRows()
          "let it send less, or raise maximum_size_mb in analytics.toml"},
         {RemovedByDamage, "removed.damage", Loss, "they were in a database that was damaged, removed or replaced",
          "look for errors of the disk in the kernel's log"},
+        {Salvaged, "salvaged", Work, "", ""},
 
         {ConnectionsAccepted, "connections.accepted", Work, "", ""},
         {ConnectionsRefused, "connections.refused.userLimit", Limit, "one user had too many connections",

@@ -47,6 +47,7 @@ enum class Counter : std::uint8_t {
     RemovedForSize,
     RemovedForShare,
     RemovedByDamage,
+    Salvaged, // messages, from a damaged database; their events were kept before, and still are
 
     ConnectionsAccepted,
     ConnectionsRefused,

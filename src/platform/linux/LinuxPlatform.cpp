@@ -53,7 +53,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
 void LinuxPlatform::finish()
 {
     workQueues_.finish();
-    analytics_.flush();
+    analytics_.finish();
 }
 
 void LinuxPlatform::giveUp(std::string_view reason)

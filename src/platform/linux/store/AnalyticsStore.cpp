@@ -38,10 +38,15 @@ AnalyticsStore::AnalyticsStore(std::unique_ptr<EventKeeper> keeper, Configuratio
       ledger_(ledger),
       log_(log),
       limits_(limits),
-      keeper_(std::move(keeper)),
       storedByLedger_(ledger.account().stored()),
+      keeper_(std::move(keeper)),
       configurationFile_(watcher, "analytics.toml", log, [this] { applyConfiguration(); })
 {
+    keeper_->setWaker([this] {
+        const foundation::Lock lock(lock_);
+        isKeeperAwake_ = true;
+        wakeKeeper();
+    });
     applyConfiguration();
     thread_ = startThread("analytics", QualityOfService::Default, [this] { run(); });
 }
@@ -131,6 +136,20 @@ void AnalyticsStore::flush()
     kept.get_future().wait();
 }
 
+void AnalyticsStore::finish()
+{
+    std::promise<void> finished;
+    {
+        const foundation::Lock lock(lock_);
+        waiting_.whenKept.emplace_back([this, &finished] {
+            keeper_->prepareForEnd(); // on its thread
+            finished.set_value();
+        });
+        wakeKeeper();
+    }
+    finished.get_future().wait();
+}
+
 // The counts of what is being written are with the store's thread: these events are counted here as if they had just
 // come. Should they be committed all the same, the next start finds them in the store.
 std::size_t AnalyticsStore::giveUp()
@@ -197,7 +216,7 @@ void AnalyticsStore::run()
         post(batch.tally); // before the answers leave: what is acknowledged is counted
         for (WhenKept& whenKept : batch.whenKept)
             whenKept();
-        finish();
+        endBatch();
         batch.clear();
         while (tidy(isQuiet) && isIdle()) { }
     }
@@ -214,6 +233,10 @@ bool AnalyticsStore::tidy(bool isQuiet)
 
 void AnalyticsStore::post(ledger::Tally& tally)
 {
+    storedByLedger_ += tally[Counter::Kept];
+    for (const Counter removed :
+         {Counter::RemovedForAge, Counter::RemovedForSize, Counter::RemovedForShare, Counter::RemovedByDamage})
+        storedByLedger_ -= tally[removed];
     const auto state = keeper_->state();
     if (state)
         settle(tally, state->events);
@@ -227,15 +250,13 @@ void AnalyticsStore::post(ledger::Tally& tally)
 // damaged, removed or replaced.
 void AnalyticsStore::settle(ledger::Tally& tally, std::uint64_t stored)
 {
-    storedByLedger_ += tally[Counter::Kept];
-    for (const Counter removed :
-         {Counter::RemovedForAge, Counter::RemovedForSize, Counter::RemovedForShare, Counter::RemovedByDamage})
-        storedByLedger_ -= tally[removed];
     if (stored > storedByLedger_) {
         tally.add(Counter::Events, stored - storedByLedger_);
         tally.add(Counter::Kept, stored - storedByLedger_);
     } else if (stored < storedByLedger_) {
         tally.add(Counter::RemovedByDamage, storedByLedger_ - stored);
+        log_.error("{} analytics events are gone: {}; {}", storedByLedger_ - stored,
+                   row(Counter::RemovedByDamage).reason, row(Counter::RemovedByDamage).remedy);
     }
     storedByLedger_ = stored;
 }
@@ -246,12 +267,13 @@ bool AnalyticsStore::take(Batch& batch)
     std::optional<AnalyticsConfiguration> configuration;
     {
         const foundation::Lock lock(lock_);
-        while (waiting_.empty() && !newConfiguration_) {
+        while (waiting_.empty() && !newConfiguration_ && !isKeeperAwake_) {
             if (isEnding_)
                 return false;
             if (!sleep())
                 break; // takes an empty batch, because the store is quiet
         }
+        isKeeperAwake_ = false;
         std::swap(configuration, newConfiguration_);
         std::swap(batch, waiting_);
         isWriting_ = !batch.empty();
@@ -282,7 +304,7 @@ void AnalyticsStore::eventsAreKept()
     eventsInWriting_ = 0;
 }
 
-void AnalyticsStore::finish()
+void AnalyticsStore::endBatch()
 {
     const foundation::Lock lock(lock_);
     isWriting_ = false;

@@ -77,6 +77,9 @@ public:
 
     // Returns when everything taken so far is committed or counted as lost.
     void flush();
+    // The same, and leaves the keeper's place as a service does that ends in order: the process ends soon without
+    // destroying the store.
+    void finish();
     // For a process that ends now: counts the events taken that are neither as lost, and returns their number. Never
     // waits for the disk.
     std::size_t giveUp();
@@ -107,7 +110,7 @@ private:
     void settle(ledger::Tally& tally, std::uint64_t stored);
     [[nodiscard]] bool sleep() KESTO_REQUIRES(lock_);
     void eventsAreKept();
-    void finish();
+    void endBatch();
     [[nodiscard]] bool isIdle();
 
     const Clock& clock_;
@@ -115,7 +118,6 @@ private:
     const ProviderLog log_;
     const Limits limits_;
     UsedEventNames names_;
-    const std::unique_ptr<EventKeeper> keeper_; // for the store's thread, except what any thread may call
     // Only for the store's thread.
     std::optional<ledger::StoreState> lastState_;
     std::uint64_t storedByLedger_; // the events that are in the store according to the ledger
@@ -128,7 +130,10 @@ private:
     std::size_t eventsInWriting_ KESTO_GUARDED_BY(lock_) = 0;
     bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until the callbacks of the batch have returned
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // so that only a caller that finds it asleep pays for waking it
+    bool isKeeperAwake_ KESTO_GUARDED_BY(lock_) = false; // it wants an empty batch
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
+    // For the store's thread, except what any thread may call. Its own threads use what stands above.
+    const std::unique_ptr<EventKeeper> keeper_;
 
     WatchedTomlFile configurationFile_;
     std::thread thread_;

@@ -10,6 +10,7 @@
 #include "platform/EventBatch.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
 
+#include <functional>
 #include <optional>
 
 namespace platform {
@@ -26,6 +27,8 @@ public:
 
     // For how long and how safely events are kept, and how many. Called before `open`, and after every change.
     virtual void setConfiguration(const AnalyticsConfiguration& configuration) = 0;
+    // Gives the keeper a way to get an empty batch soon, from any thread. Called before `open`.
+    virtual void setWaker(std::function<void()> wake) = 0;
     // Opens the place for events, or makes it. Called once, before the first `keep`. If it fails, the keeper logs this,
     // and the store goes on as if it had not: `keep` tries again, and counts the events as lost while that fails.
     virtual void open() = 0;
@@ -38,7 +41,9 @@ public:
     // Does a part of the tidying that is due: removes events that are too old or too many. True if more is left to do.
     // `isQuiet`: no events wait now.
     virtual bool tidy(bool isQuiet, ledger::Tally& tally) = 0;
-    // What the place holds now; nothing while it is not open.
+    // Leaves the place as a service does that ends in order, because the process ends soon without closing it.
+    virtual void prepareForEnd() = 0;
+    // What the place holds now; nothing while it is not open, or while it gets back what damage took away.
     [[nodiscard]] virtual std::optional<ledger::StoreState> state() const = 0;
     // Logs the lost events that the log does not show yet. Never waits for the disk. Any thread.
     virtual void reportLosses() = 0;

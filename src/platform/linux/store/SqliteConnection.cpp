@@ -199,6 +199,13 @@ bool SqliteConnection::emptyLog(std::chrono::milliseconds wait)
     return done == SQLITE_OK;
 }
 
+void SqliteConnection::truncateLog()
+{
+    ::sqlite3_busy_timeout(connection_.get(), 0);
+    ::sqlite3_wal_checkpoint_v2(connection_.get(), "main", SQLITE_CHECKPOINT_TRUNCATE, nullptr, nullptr);
+    ::sqlite3_busy_timeout(connection_.get(), static_cast<int>(longestWaitForLock.count()));
+}
+
 StoreExpected<> SqliteConnection::execute(const char* sql)
 {
     if (::sqlite3_exec(connection_.get(), sql, nullptr, nullptr, nullptr) == SQLITE_OK)

@@ -75,6 +75,8 @@ public:
     // Moves the log to the database, as far as readers allow, and waits for them that long. True if all was moved and
     // no reader needs the log. False also after an error of the disk: a log can be moved later.
     [[nodiscard]] bool emptyLog(std::chrono::milliseconds wait);
+    // The same without a wait, and makes the log's file empty, as closing the connection does.
+    void truncateLog();
 
     [[nodiscard]] StoreExpected<> execute(const char* sql);
     // The first column of the first row.

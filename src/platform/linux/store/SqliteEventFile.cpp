@@ -5,7 +5,6 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/file.h>
-#include <sys/stat.h>
 #include <utility>
 #include <vector>
 
@@ -53,12 +52,6 @@ SqliteEventFile::Expected<> SqliteEventFile::connect()
     if (!connection)
         return std::unexpected(connection.error());
     connection_ = std::move(*connection);
-
-    struct stat status = {};
-    if (::stat(path_.c_str(), &status) != 0)
-        return std::unexpected(StoreError::CannotOpen);
-    device_ = status.st_dev;
-    inode_ = status.st_ino;
     return {};
 }
 
@@ -145,12 +138,6 @@ SqliteEventFile::Expected<> SqliteEventFile::beginRun()
             return done;
         return isKnown ? Expected<>() : originRows_.closeEarlierRun(counts);
     });
-}
-
-bool SqliteEventFile::wasReplaced() const
-{
-    struct stat status = {};
-    return ::stat(path_.c_str(), &status) != 0 || status.st_dev != device_ || status.st_ino != inode_;
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::setSynchronization(StoreSynchronization synchronization)

@@ -41,8 +41,8 @@ public:
     SqliteEventFile& operator=(const SqliteEventFile&) = delete;
     ~SqliteEventFile();
 
-    // Whether the path now leads to another file or to none, so that no reader finds what is written here.
-    [[nodiscard]] bool wasReplaced() const;
+    // For what is not events: the database must be opened again when its tables were changed.
+    [[nodiscard]] SqliteConnection& connection() noexcept { return *connection_; }
 
     [[nodiscard]] Expected<> setSynchronization(StoreSynchronization synchronization);
 
@@ -129,8 +129,6 @@ private:
     KnownOrigins& origins_;
     FileDescriptor directoryLock_;
     std::unique_ptr<SqliteConnection> connection_; // outlives the statements below
-    std::uint64_t device_ = 0; // with the inode, identifies the file under any name
-    std::uint64_t inode_ = 0;
     std::uint64_t pageSize_ = 0;
     StoreCountsRow counts_;
     EventKinds kinds_;

@@ -5,10 +5,8 @@
 #include "platform/linux/files/SmallFile.h"
 
 #include <algorithm>
-#include <array>
-#include <fmt/chrono.h>
-#include <set>
 #include <system_error>
+#include <tuple>
 #include <utility>
 
 namespace platform {
@@ -20,16 +18,11 @@ constexpr std::uint64_t bytesOfARow = 64; // besides its payload, roughly
 constexpr std::uint64_t bytesTidiedAtOnce = 1024 * 1024;
 constexpr double secondsADay = 86400;
 
-fs::path withSuffix(const fs::path& path, std::string_view suffix)
+bool hasContent(const fs::path& file)
 {
-    return fs::path(path).concat(suffix);
+    std::error_code error;
+    return fs::file_size(file, error) > 0 && !error;
 }
-
-constexpr std::string_view damagedMark = ".corrupt-";
-constexpr std::string_view newerMark = ".newer-";
-
-// The files that SQLite keeps beside a database, by the ends of their names.
-constexpr std::array<std::string_view, 2> companions = {"-wal", "-shm"};
 
 // Empty where the kernel does not say it.
 std::string bootIdentifier()
@@ -48,7 +41,12 @@ SqliteKeeper::SqliteKeeper(const fs::path& directory, const Clock& clock, Provid
       clock_(clock),
       log_(log),
       losses_(path_, clock, log),
-      removals_(clock, log)
+      removals_(clock, log),
+      repair_(path_, clock, log),
+      check_(path_, clock, [this] {
+          if (wake_)
+              wake_();
+      })
 {
     origins_.bootIdentifier = bootIdentifier();
 }
@@ -79,17 +77,13 @@ void SqliteKeeper::open()
 
 SqliteKeeper::Expected<> SqliteKeeper::ensureOpen()
 {
-    if (database_ && !database_->wasReplaced())
+    if (database_)
         return {};
-    if (database_) {
-        log_.error("{} was removed or replaced; events are now kept in the file that is there, or in a new one",
-                   path_.native());
-        database_.reset();
-    } else if (clock_.systemUptime() < openAgainAt_) {
+    if (clock_.systemUptime() < openAgainAt_)
         return std::unexpected(openError_);
-    }
     const auto done = openAnew();
     if (!done) {
+        close();
         openError_ = done.error();
         openAgainAt_ = clock_.systemUptime() + secondsBetweenOpenings;
     }
@@ -98,13 +92,33 @@ SqliteKeeper::Expected<> SqliteKeeper::ensureOpen()
 
 SqliteKeeper::Expected<> SqliteKeeper::openAnew()
 {
+    repair_.finishRenaming();
+    if (hasContent(withSuffix(path_, "-wal")))
+        check_.ask(); // a service that ends in order leaves an empty log
+    auto done = connect();
+    if (!done && (done.error() == StoreError::Corrupt || done.error() == StoreError::Newer)
+        && repair_.setAside(done.error()))
+        done = connect();
+    if (!done)
+        return done;
+    const auto isDamaged = repair_.begin(*database_);
+    if (!isDamaged)
+        return std::unexpected(isDamaged.error());
+    if (*isDamaged) {
+        origins_.epoch.clear(); // so that the sources and sessions that were saved end
+        done = connect();
+    }
+    return done;
+}
+
+SqliteKeeper::Expected<> SqliteKeeper::connect()
+{
+    close();
     auto opened = SqliteEventFile::open(path_, clock_, origins_);
-    if (!opened && (opened.error() == StoreError::Corrupt || opened.error() == StoreError::Newer)
-        && setAside(opened.error()))
-        opened = SqliteEventFile::open(path_, clock_, origins_);
     if (!opened)
         return std::unexpected(opened.error());
-    database_ = std::move(*opened);
+    database_ = *std::move(opened);
+    files_.emplace(path_);
     bytes_ = 0;
     oldest_ = 0;
     hasMoreToTidy_ = true; // which also completes the state
@@ -112,49 +126,19 @@ SqliteKeeper::Expected<> SqliteKeeper::openAnew()
     return database_->setSynchronization(configuration_.synchronization);
 }
 
-// Renames the database, which must be closed. One of a later version is good, so it is never removed.
-bool SqliteKeeper::setAside(StoreError reason)
+// As long as a connection of the process is open, SQLite gives its index of the log to the next one too, also if that
+// has another log.
+void SqliteKeeper::close()
 {
-    const bool isNewer = reason == StoreError::Newer;
-    if (!isNewer)
-        removeOldestDamaged();
-    const auto now = static_cast<std::time_t>(clock_.secondsSince1970());
-    const fs::path wanted =
-        withSuffix(path_, fmt::format("{}{:%Y%m%dT%H%M%SZ}", isNewer ? newerMark : damagedMark, fmt::gmtime(now)));
-    fs::path target = wanted;
-    std::error_code error;
-    for (int number = 2; fs::exists(target, error); ++number)
-        target = withSuffix(wanted, fmt::format(".{}", number));
-
-    fs::rename(path_, target, error);
-    if (error)
-        return false;
-    for (const std::string_view suffix : companions) {
-        std::error_code isNotThere;
-        fs::rename(withSuffix(path_, suffix), withSuffix(target, suffix), isNotThere);
-    }
-    log_.error("{} {}; it is now {}, and a new one is begun", path_.native(),
-               isNewer ? "was made by a later version of the service" : "is damaged or not a database of events",
-               target.native());
-    return true;
+    check_.breakOff();
+    database_.reset();
 }
 
-void SqliteKeeper::removeOldestDamaged()
+void SqliteKeeper::prepareForEnd()
 {
-    std::set<fs::path> damaged; // oldest first, because the time is in the name
-    std::error_code error;
-    for (fs::directory_iterator file(path_.parent_path(), error); file != end(file); file.increment(error)) {
-        const std::string name = file->path().filename();
-        const auto isCompanion = [&name](std::string_view suffix) { return name.ends_with(suffix); };
-        if (name.starts_with(fmt::format("{}{}", fileName, damagedMark))
-            && std::ranges::none_of(companions, isCompanion))
-            damaged.insert(file->path());
-    }
-    for (; damaged.size() >= mostDamagedKept; damaged.erase(damaged.begin())) {
-        fs::remove(*damaged.begin(), error);
-        for (const std::string_view suffix : companions)
-            fs::remove(withSuffix(*damaged.begin(), suffix), error);
-    }
+    check_.breakOff();
+    if (database_)
+        database_->connection().truncateLog(); // if a reader needs it, the next start checks the database for nothing
 }
 
 // --- Keeping
@@ -173,8 +157,8 @@ void SqliteKeeper::keep(EventBatch& events, ledger::Tally& tally)
     if (rows.empty() && !endsRows(announced))
         return losses_.report();
     auto done = write(rows, announced);
-    if (!done && done.error() == StoreError::Corrupt)
-        done = write(rows, announced); // now into a new database
+    if (done ? !areFilesInPlace() : done.error() == StoreError::Corrupt)
+        done = write(rows, announced); // now into another database
     origins_.end(announced); // also where nothing could be written
     if (done)
         tally.add(ledger::Counter::Kept, count);
@@ -191,7 +175,7 @@ void SqliteKeeper::lose(StoreError reason, std::uint64_t events, ledger::Tally& 
 
 std::optional<ledger::StoreState> SqliteKeeper::state() const
 {
-    if (!database_)
+    if (!database_ || !repair_.isDone())
         return std::nullopt;
     return ledger::StoreState{.events = database_->events(), .bytes = bytes_, .oldest = oldest_};
 }
@@ -211,7 +195,7 @@ SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows, con
     const auto insertAll = [&]() -> Expected<> {
         if (const auto done = ensureOpen(); !done)
             return done;
-        if (database_->logBytes() > maximumBytes() && !emptyLog())
+        if (isLogFull())
             return std::unexpected(StoreError::LogHeld);
         if (const auto done = database_->begin(); !done)
             return done;
@@ -238,9 +222,45 @@ void SqliteKeeper::handleFailure(StoreError error)
     if (error == StoreError::DiskFull || error == StoreError::Locked || error == StoreError::LogHeld)
         return; // the connection can still be used
     const bool wasOpen = database_ != nullptr;
-    database_.reset();
-    if (error == StoreError::Corrupt && wasOpen)
-        setAside(error); // if that fails, the next opening finds it damaged again
+    close();
+    if (error == StoreError::InputOutput)
+        check_.ask();
+    if (error == StoreError::Corrupt && wasOpen && repair_.setAside(error)) {
+        std::ignore = ensureOpen(); // if that fails, the next event tries again
+        hasBegunAnew_ = true;
+    }
+}
+
+// Whether readers find what was just committed. The question comes after each commit, so no event is acknowledged that
+// went into a file that is gone. Closes a database that is.
+bool SqliteKeeper::areFilesInPlace()
+{
+    switch (files_->change()) {
+    case FilesInPlace::Change::None: return true;
+    case FilesInPlace::Change::Database:
+        log_.error("{} was removed or replaced; events are now kept in the file that is there, or in a new one",
+                   path_.native());
+        close();
+        files_->removeNotedCompanions();
+        return false;
+    case FilesInPlace::Change::Companions: replaceLog(); return true;
+    }
+    return true;
+}
+
+// The connection still has the log open, so that everything can be moved to the database.
+void SqliteKeeper::replaceLog()
+{
+    check_.breakOff();
+    if (!emptyLog())
+        return; // a reader needs the log; tried again after the next commit
+    log_.error("the write-ahead log of {} or its index was removed or replaced; the events are moved from it to the "
+               "database, and a new log is begun",
+               path_.native());
+    close();
+    files_->removeCompanions();
+    check_.ask();
+    std::ignore = ensureOpen(); // the next commit tries again
 }
 
 // --- Housekeeping
@@ -252,27 +272,74 @@ bool SqliteKeeper::awaitsQuiet() const
 
 bool SqliteKeeper::tidy(bool isQuiet, ledger::Tally& tally)
 {
+    const bool hasMore = tidySome(isQuiet, tally);
+    return std::exchange(hasBegunAnew_, false) || hasMore;
+}
+
+bool SqliteKeeper::tidySome(bool isQuiet, ledger::Tally& tally)
+{
     losses_.report();
     removals_.report();
+    heedCheck();
+    if (const std::uint64_t saved = repair_.takeSavedMessages(); saved != 0)
+        tally.add(ledger::Counter::Salvaged, saved);
     if (!database_)
         return false;
     if (database_->logBytes() < logBytesAtCheckpoint_)
         logBytesAtCheckpoint_ = 0; // the log started again
     if (isLogLongerBy(isQuiet ? logBytesBetweenCheckpoints : mostLogBytesBetweenCheckpoints))
         emptyLog();
-    if (database_->hasFirstEdition() && database_->logBytes() <= maximumBytes())
+    if (!repair_.isDone())
+        return salvageSome();
+    if (database_->hasFirstEdition() && !isLogFull())
         return moveFirstEdition(tally);
     const bool isDue = hasMoreToTidy_ || bytesSinceCheck_ >= bytesBetweenChecks
         || clock_.systemUptime() - checkedAt_ >= secondsBetweenChecks;
-    hasMoreToTidy_ =
-        isDue && database_->logBytes() <= maximumBytes() && makeRoom(tally); // deleting makes the log longer
+    hasMoreToTidy_ = isDue && !isLogFull() && makeRoom(tally); // deleting makes the log longer
     return hasMoreToTidy_;
+}
+
+// Sets a database aside in which the check found damage. A check that keeps the log from starting again for too long
+// gives way; one that looks at a database without its log would find it damaged.
+void SqliteKeeper::heedCheck()
+{
+    if (!database_)
+        return;
+    if (database_->logBytes() > maximumBytes() / 2 || files_->change() != FilesInPlace::Change::None)
+        check_.breakOff();
+    else if (repair_.isDone())
+        check_.beginIfDue();
+    if (check_.takeFinding() == DamageCheck::Finding::Damaged)
+        handleFailure(StoreError::Corrupt);
+}
+
+// True if more is left to do. Nothing is removed meanwhile: what is too old or too much shows when all events are
+// there.
+bool SqliteKeeper::salvageSome()
+{
+    if (isLogFull())
+        return false;
+    auto done = repair_.goOn(*database_);
+    if (done && repair_.isDone())
+        done = connect();
+    if (!done)
+        handleFailure(done.error());
+    return done.has_value();
 }
 
 // Longer than at the last checkpoint.
 bool SqliteKeeper::isLogLongerBy(std::uint64_t bytes) const
 {
     return database_->logBytes() >= logBytesAtCheckpoint_ + std::min(bytes, maximumBytes() / 4);
+}
+
+// Whether a reader has kept the log until it gets nothing more. The check, which is a reader too, gives way.
+bool SqliteKeeper::isLogFull()
+{
+    if (database_->logBytes() <= maximumBytes())
+        return false;
+    check_.breakOff();
+    return !emptyLog();
 }
 
 bool SqliteKeeper::emptyLog()

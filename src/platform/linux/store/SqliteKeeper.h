@@ -1,17 +1,23 @@
-// Keeps events in an SQLite database in spite of all failures: it sets a damaged database aside and makes a new one,
-// counts and logs the events that it cannot keep, and removes those that are too old or too many.
+// Keeps events in an SQLite database in spite of all failures: it looks for damage, sets a damaged database
+// aside and saves what can be read in it, counts and logs the events that it cannot keep, and removes those that are
+// too old or too many.
 #pragma once
 
 #include "platform/Clock.h"
+#include "platform/linux/damage/DamageCheck.h"
+#include "platform/linux/damage/FilesInPlace.h"
 #include "platform/linux/log/ProviderLog.h"
 #include "platform/linux/store/EventKeeper.h"
 #include "platform/linux/store/EventLosses.h"
 #include "platform/linux/store/RemovalReport.h"
+#include "platform/linux/store/Repair.h"
 #include "platform/linux/store/SqliteEventFile.h"
 
 #include <cstdint>
 #include <filesystem>
+#include <functional>
 #include <memory>
+#include <optional>
 #include <span>
 #include <string_view>
 
@@ -21,7 +27,6 @@ namespace platform {
 class SqliteKeeper final : public EventKeeper {
 public:
     static constexpr std::string_view fileName = "analytics.sqlite3";
-    static constexpr std::size_t mostDamagedKept = 3; // databases set aside; older ones are removed
     static constexpr double secondsBetweenOpenings = 1; // of a database that could not be opened
     // The length at which the write-ahead log is moved to the database in a quiet moment, and the length at which it is
     // moved in any case; a quarter of the size limit if that is less. The next commit waits meanwhile, about as long as
@@ -43,10 +48,12 @@ public:
 
     void setConfiguration(const AnalyticsConfiguration& configuration) override;
 
+    void setWaker(std::function<void()> wake) override { wake_ = std::move(wake); }
     void open() override;
     void keep(EventBatch& events, ledger::Tally& tally) override; // in one transaction
     [[nodiscard]] bool awaitsQuiet() const override;
     bool tidy(bool isQuiet, ledger::Tally& tally) override;
+    void prepareForEnd() override;
     [[nodiscard]] std::optional<ledger::StoreState> state() const override;
     void reportLosses() override { losses_.reportAll(); }
 
@@ -55,13 +62,19 @@ private:
 
     [[nodiscard]] Expected<> ensureOpen();
     [[nodiscard]] Expected<> openAnew();
-    bool setAside(StoreError reason);
-    void removeOldestDamaged();
+    [[nodiscard]] Expected<> connect();
+    void close();
+    [[nodiscard]] bool areFilesInPlace();
+    void replaceLog();
+    void heedCheck();
+    [[nodiscard]] bool salvageSome();
+    [[nodiscard]] bool tidySome(bool isQuiet, ledger::Tally& tally);
     [[nodiscard]] Expected<> write(std::span<const EventRow> rows, const OriginAnnouncements& announced);
     [[nodiscard]] bool endsRows(const OriginAnnouncements& announced);
     void handleFailure(StoreError error);
     void lose(StoreError reason, std::uint64_t events, ledger::Tally& tally);
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
+    [[nodiscard]] bool isLogFull();
     bool emptyLog();
     void count(const SqliteEventFile::Removal& removal, ledger::Tally& tally);
     [[nodiscard]] bool moveFirstEdition(ledger::Tally& tally);
@@ -77,7 +90,11 @@ private:
     RemovalReport removals_;
     KnownOrigins origins_;
 
+    std::function<void()> wake_;
+
     std::unique_ptr<SqliteEventFile> database_; // null: could not be opened
+    std::optional<FilesInPlace> files_; // of the database
+    Repair repair_;
     std::uint64_t bytes_ = 0; // of the database, as of the last check, as the next
     double oldest_ = 0; // the time of its first event; 0 without events
     StoreError openError_ = StoreError::Other;
@@ -87,6 +104,9 @@ private:
     double checkedAt_ = 0; // the last check of age and size
     std::uint64_t bytesSinceCheck_ = 0;
     bool hasMoreToTidy_ = true;
+    bool hasBegunAnew_ = false; // a new database, because the old one was damaged
+
+    DamageCheck check_; // last: its thread ends first
 };
 
 } // namespace platform

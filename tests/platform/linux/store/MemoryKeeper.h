@@ -48,7 +48,9 @@ public:
     {
         configuration_ = configuration;
     }
+    void setWaker(std::function<void()>) override { }
     void open() override { }
+    void prepareForEnd() override { }
     void keep(platform::EventBatch& events, ledger::Tally& tally) override
     {
         std::vector<KeptEvent> given;

@@ -77,6 +77,8 @@ std::vector<PlainEvent> events(std::size_t count, std::size_t payloadSize = 300,
 
 class SqliteKeeperTest : public testing::Test {
 protected:
+    // No check is due, which would read beside the tests' readers.
+    SqliteKeeperTest() { support::writeFile(file().string() + "-checked", "1800000000"); }
     SqliteKeeper& keeper()
     {
         if (!keeper_) {

@@ -115,6 +115,16 @@ StoreExpected<> StoreSchema::make(SqliteConnection& connection)
     return connection.execute(transaction(fmt::format("{} {}", tables, view)).c_str());
 }
 
+StoreExpected<> StoreSchema::makeFirstEdition(SqliteConnection& connection)
+{
+    return connection.execute(
+        fmt::format("BEGIN IMMEDIATE; CREATE TABLE first_edition(id INTEGER PRIMARY KEY AUTOINCREMENT,"
+                    " time REAL NOT NULL, name TEXT NOT NULL, payload TEXT NOT NULL) STRICT;"
+                    " DROP VIEW events; {}{}; COMMIT",
+                    view, withFirstEdition)
+            .c_str());
+}
+
 StoreExpected<> StoreSchema::dropFirstEdition(SqliteConnection& connection)
 {
     return connection.execute(

@@ -34,6 +34,8 @@ public:
     // Makes the tables in an empty file. A file of the first edition gets them beside its events, at once, however many
     // it has: `FirstEdition` moves them later. Newer: a later edition; Corrupt: not a database of events.
     [[nodiscard]] static StoreExpected<> make(SqliteConnection& connection);
+    // Makes an empty table of the first edition, and lets the view show it.
+    [[nodiscard]] static StoreExpected<> makeFirstEdition(SqliteConnection& connection);
     // Ends the time of the first edition's table, which must be empty.
     [[nodiscard]] static StoreExpected<> dropFirstEdition(SqliteConnection& connection);
 };
