@@ -119,7 +119,7 @@ struct CounterRow {
 // The counter of that path.
 [[nodiscard]] std::optional<Counter> counterOf(std::string_view path) noexcept;
 
-// The first keys of what somebody caused: for these the ledger also knows by whom.
+// The first keys of what clients cause: for these the ledger also knows which client.
 enum class Charge : std::uint8_t { Refused, Lost, Removed };
 inline constexpr std::size_t chargeCount = static_cast<std::size_t>(Charge::Removed) + 1;
 

@@ -83,7 +83,7 @@ struct LedgerImage {
     std::array<Slot, 2> slots;
     std::array<CulpritSlot, 2> culprits;
 
-    // Makes it hold the account, whatever it held before.
+    // Makes it hold the account, and nothing of before.
     void begin(const Account& account);
     // Whether a ledger of this version can go on counting in it.
     [[nodiscard]] bool canGoOn() const;

@@ -22,7 +22,7 @@ public:
         Culprit culprit;
         std::uint64_t count;
     };
-    // What goes beyond is charged to nobody known.
+    // What goes beyond is charged to no known culprit.
     static constexpr std::size_t mostCharged = 256;
 
     void add(Counter counter, std::uint64_t count = 1) noexcept

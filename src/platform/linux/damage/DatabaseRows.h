@@ -3,7 +3,7 @@
 // SQLite finds a row only through the pages above it, so that a damaged one takes everything below along. But a page
 // with rows says so in its first byte, and its rows are whole in themselves, except for long ones, which go on in
 // further pages. So this reads the rows of every page that still is one. Which table they belong to only those other
-// pages would say; whoever reads the rows must know it by their values.
+// pages would say; the reader of the rows must know it by their values.
 //
 // No client can forge a page with rows: its bytes are written behind the number of the next page, and that begins with
 // zero.

@@ -39,7 +39,7 @@ public:
     [[nodiscard]] Change change();
     // Removes those companions that were noted and still are in their place: they belong to a database that is not.
     void removeNotedCompanions() const;
-    // Removes all companions, whosever they are.
+    // Removes all companions, those of other databases too.
     void removeCompanions() const;
 
 private:

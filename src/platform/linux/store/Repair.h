@@ -1,5 +1,5 @@
 // What is done about a damaged database: it is set aside, a new one takes the events that come, and what can be read in
-// the damaged one is copied into the new one between them. A service that ends meanwhile begins to copy anew at its
+// the damaged one is copied into the new one between them. A service that ends meanwhile begins to copy again at its
 // next start.
 #pragma once
 

@@ -1,4 +1,4 @@
-// Each batch prepares its statements anew: it costs little, and none is left when the database is closed.
+// Each batch prepares its statements again: it costs little, and none is left when the database is closed.
 #include "platform/linux/store/Salvage.h"
 
 #include "platform/linux/store/tables/SalvagedTables.h"

@@ -3,7 +3,7 @@
 //
 // It knows no table by its columns: a row belongs to the table of the new database whose declared types its values
 // have. Rows keep their numbers, so copying a row again changes nothing, and a salvage that was cut short is simply
-// begun anew.
+// begun again.
 //
 // Messages are copied little by little, unless they are few. The other tables, to which they refer, are small, and are
 // copied before the new database takes events.

@@ -41,7 +41,7 @@ public:
     struct Largest {
         std::int64_t id = 0;
         EventHolder holder;
-        bool isOnlyOne = false; // nobody else holds anything
+        bool isOnlyOne = false; // no other holds anything
         std::int64_t oldest = 0;
     };
 
@@ -54,7 +54,7 @@ public:
     void remove(std::int64_t id, std::int64_t payloadBytes);
     // Its events below that ID are gone.
     void setOldest(std::int64_t id, std::int64_t event);
-    // It has no events, whatever was counted.
+    // It has no events, although some were counted.
     void setEmpty(std::int64_t id);
     [[nodiscard]] std::optional<Largest> largest() const;
 
