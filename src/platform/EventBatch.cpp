@@ -28,6 +28,14 @@ template <typename Element> void moveBehind(std::vector<Element>& elements, std:
     others.clear();
 }
 
+template <typename Messages> EventsByOrigin countByOrigin(const Messages& messages)
+{
+    EventsByOrigin counts;
+    for (const auto& message : messages)
+        counts[message.origin] += message.events();
+    return counts;
+}
+
 std::optional<double> timeIn(const foundation::Dictionary& payload)
 {
     const foundation::Value* const stamp = payload.find(timestampKey);
@@ -115,6 +123,7 @@ void EventBatch::clear()
     platform::clear(payloads_, mostElementsKept);
     platform::clear(texts_, mostBytesKept);
     platform::clear(rows_, mostElementsKept);
+    platform::clear(rowsWithoutJson_, mostElementsKept);
     announcements_ = {};
     lastPayload_ = {};
     waitingBytes_ = 0;
@@ -133,10 +142,23 @@ std::span<const EventRow> EventBatch::rows()
         if (const auto waiting = std::exchange(payload.waiting, {}); !waiting.empty())
             payload.json = write(waiting);
     rows_.clear();
-    for (const auto& [time, happened, origin, name, secondName, payload] : messages_)
-        if (const auto& json = payloads_[payload].json; json.size != 0)
-            rows_.push_back({time, happened, origin, view(name), view(secondName), view(json)});
+    rowsWithoutJson_.clear();
+    for (const auto& [time, happened, origin, name, secondName, payload] : messages_) {
+        const Text& json = payloads_[payload].json;
+        auto& rows = json.size != 0 ? rows_ : rowsWithoutJson_;
+        rows.push_back({time, happened, origin, view(name), view(secondName), view(json)});
+    }
     return rows_;
+}
+
+EventsByOrigin EventBatch::eventsByOrigin() const
+{
+    return countByOrigin(messages_);
+}
+
+EventsByOrigin eventsByOrigin(std::span<const EventRow> rows)
+{
+    return countByOrigin(rows);
 }
 
 EventBatch::Text EventBatch::append(std::string_view text)

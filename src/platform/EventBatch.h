@@ -37,6 +37,8 @@ struct EventRow {
     [[nodiscard]] std::uint64_t events() const noexcept { return secondName.empty() ? 1 : 2; }
 };
 
+[[nodiscard]] EventsByOrigin eventsByOrigin(std::span<const EventRow> rows);
+
 // One thread at a time.
 class EventBatch {
 public:
@@ -68,6 +70,10 @@ public:
     // The messages in their order, without those with a payload that JSON cannot express. Valid until the batch
     // changes.
     [[nodiscard]] std::span<const EventRow> rows();
+    // Those that the last call of `rows` left out; they have no payload. Valid as long as its result.
+    [[nodiscard]] std::span<const EventRow> rowsWithoutJson() const noexcept { return rowsWithoutJson_; }
+    // Of all events. Also while another thread calls `rows`.
+    [[nodiscard]] EventsByOrigin eventsByOrigin() const;
     [[nodiscard]] const OriginAnnouncements& announcements() const noexcept { return announcements_; }
 
 private:
@@ -82,6 +88,8 @@ private:
         Text name;
         Text secondName;
         std::size_t payload; // its place in `payloads_`
+
+        [[nodiscard]] std::uint64_t events() const noexcept { return secondName.size == 0 ? 1 : 2; }
     };
     struct Payload {
         Text json; // empty where there is none
@@ -101,6 +109,7 @@ private:
     std::string texts_;
     std::size_t waitingBytes_ = 0;
     std::vector<EventRow> rows_;
+    std::vector<EventRow> rowsWithoutJson_;
     OriginAnnouncements announcements_;
 };
 

@@ -5,8 +5,10 @@
 #pragma once
 
 #include <atomic>
+#include <compare>
 #include <cstddef>
 #include <cstdint>
+#include <map>
 #include <string>
 #include <vector>
 
@@ -17,8 +19,11 @@ struct Origin {
     std::uint64_t source = 0;
     std::uint64_t session = 0;
 
-    friend bool operator==(const Origin&, const Origin&) = default;
+    friend auto operator<=>(const Origin&, const Origin&) = default;
 };
+
+// How many events each has.
+using EventsByOrigin = std::map<Origin, std::uint64_t>;
 
 // The next number of a source or of a session. Any thread.
 [[nodiscard]] inline std::uint64_t nextOriginNumber() noexcept

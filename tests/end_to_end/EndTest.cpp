@@ -2,6 +2,7 @@
 // yields, and ends with status 0, within five seconds in any case.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/ServiceManager.h"
+#include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
 
 #include <algorithm>
@@ -249,6 +250,10 @@ TEST_F(EndWithAHangingDiskTest, TheServiceEndsInTimeAndSaysWhatIsNotStored)
                 HasSubstr("the end was cut short: it takes longer than 4500ms: given up: 0 calls and ends of "
                           "connections, 0 items of background work, 3 events that were not stored yet\n"));
     EXPECT_THAT(kestod.log(), HasSubstr("lost since the start: lost.end 3\n"));
+    const auto lost = readLedger(kestod).culprits[static_cast<std::size_t>(ledger::Charge::Lost)];
+    ASSERT_THAT(lost, SizeIs(1));
+    EXPECT_EQ(lost[0].culprit, (ledger::Culprit{.user = ::getuid(), .process = "end_to_end_test", .application = {}}));
+    EXPECT_EQ(lost[0].count, 3U);
     EXPECT_THAT(kestod.events(startEvents), SizeIs(1));
     EXPECT_TRUE(client->isClosed()) << "it was not answered";
 }

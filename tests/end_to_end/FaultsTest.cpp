@@ -1,14 +1,13 @@
 // Faults of every kind, and what the ledger says after each: nothing goes uncounted.
 #include "end_to_end/Kestod.h"
+#include "end_to_end/SmallDisk.h"
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
 
 #include <atomic>
 #include <cmath>
-#include <fstream>
 #include <gmock/gmock.h>
 #include <sqlite3.h>
-#include <sys/mount.h>
 #include <thread>
 #include <tuple>
 #include <unistd.h>
@@ -165,41 +164,28 @@ TEST_F(FaultsTest, AStoreThatIsTruncatedWhileTheServiceIsStopped)
     EXPECT_THAT(brokenSums(kestod), IsEmpty());
 }
 
-// The disk of the state directory has 2 MB.
 class FullDiskTest : public FaultsTest {
 protected:
     void SetUp() override
     {
-        if (::mount("none", state().c_str(), "tmpfs", 0, "size=2m") != 0)
+        if (!disk.isMounted())
             GTEST_SKIP() << "needs the right to mount";
-        isMounted_ = true;
         FaultsTest::SetUp();
     }
-    void TearDown() override
-    {
-        kestod.kill();
-        if (isMounted_)
-            ::umount2(state().c_str(), MNT_DETACH);
-    }
-    [[nodiscard]] fs::path state() const { return kestod.directory() / "state"; }
+    void TearDown() override { kestod.kill(); }
 
-private:
-    bool isMounted_ = false;
+    const SmallDisk disk{kestod.directory() / "state"};
 };
 
 TEST_F(FullDiskTest, ADiskThatIsFullAndFreeAgainLosesWhatItCountsAsLost)
 {
     WireClient client = connect();
     send(client, 10);
-    const fs::path ballast = state() / "ballast";
-    {
-        std::ofstream file(ballast);
-        while (file << std::string(4096, 'x')) { }
-    }
+    disk.fill();
     send(client, 100, 4000);
     EXPECT_GT(counted(Counter::LostToDiskFull), 0U);
     EXPECT_THAT(brokenSums(kestod), IsEmpty());
-    fs::remove(ballast);
+    disk.makeRoom();
     const std::uint64_t kept = counted(Counter::Kept);
     send(client, 10);
     EXPECT_EQ(counted(Counter::Kept), kept + 20) << "it keeps events again";

@@ -25,6 +25,18 @@ ledger::Account readLedger(const Kestod& kestod)
     throw std::runtime_error("there is no ledger");
 }
 
+namespace {
+
+std::uint64_t charged(const ledger::Account& account, ledger::Charge charge)
+{
+    std::uint64_t sum = 0;
+    for (const ledger::CulpritCount& culprit : account.culprits[static_cast<std::size_t>(charge)])
+        sum += culprit.count;
+    return sum;
+}
+
+} // namespace
+
 std::vector<std::string> brokenSums(const ledger::Account& account, std::uint64_t stored)
 {
     std::vector<std::string> broken;
@@ -38,6 +50,7 @@ std::vector<std::string> brokenSums(const ledger::Account& account, std::uint64_
     check("events = kept + unwanted + lost", account[Counter::Events],
           account[Counter::Kept] + account[Counter::Unwanted] + account.sum(ledger::Charge::Lost));
     check("kept = stored + removed", account[Counter::Kept], stored + account.sum(ledger::Charge::Removed));
+    check("lost = charged to culprits", account.sum(ledger::Charge::Lost), charged(account, ledger::Charge::Lost));
     return broken;
 }
 

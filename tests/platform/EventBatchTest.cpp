@@ -209,6 +209,28 @@ TEST(EventBatchTest, AStampThatIsANumberSaysWhenTheMessageHappened)
     EXPECT_EQ(batch.rows()[0].happened, std::nullopt);
 }
 
+// --- Origins
+
+TEST(EventBatchTest, SaysHowManyEventsAreOfWhichOrigin)
+{
+    const Origin player{.source = 7, .session = 9};
+    const Origin recorder{.source = 8, .session = 0};
+    const Dictionary message{{"n", 1}};
+    EventBatch batch;
+    batch.add(1, player, "a", message);
+    batch.add(1, player, "b", message); // the second event of the message
+    batch.add(1, recorder, "a", notJson);
+    batch.add(1, {}, "a", large('x'));
+    batch.add(1, player, "c", {{"n", 2}});
+    EXPECT_THAT(batch.eventsByOrigin(),
+                ElementsAre(std::pair(Origin(), 1U), std::pair(player, 3U), std::pair(recorder, 1U)));
+    EXPECT_THAT(eventsByOrigin(batch.rows()), ElementsAre(std::pair(Origin(), 1U), std::pair(player, 3U)));
+    EXPECT_THAT(eventsByOrigin(batch.rowsWithoutJson()), ElementsAre(std::pair(recorder, 1U)));
+    batch.clear();
+    EXPECT_THAT(batch.eventsByOrigin(), IsEmpty());
+    EXPECT_THAT(batch.rowsWithoutJson(), IsEmpty());
+}
+
 // --- Announcements
 
 TEST(EventBatchTest, AnnouncementsAreJoinedAndForgottenLikeEvents)

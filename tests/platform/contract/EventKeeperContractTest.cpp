@@ -143,6 +143,18 @@ TEST_P(EventKeeperContract, LosesOnlyAnEventThatJsonCannotSayAndCountsIt)
     EXPECT_EQ(tally[Counter::LostToDiskFull], 0U);
 }
 
+TEST_P(EventKeeperContract, ChargesALossToWhoSentTheEvent)
+{
+    batch.announce(platform::SourceBegin{.number = 7, .userIdentifier = 1000, .processName = "player"});
+    batch.add(1, {.source = 7, .session = 0}, "com.quarn.a", {{"n", std::numeric_limits<double>::infinity()}});
+    add({{"n", std::numeric_limits<double>::infinity()}}); // from a source that is not known
+    keep();
+    EXPECT_EQ(tally[Counter::LostNotJson], 2U);
+    ASSERT_EQ(tally.charged().size(), 1U);
+    EXPECT_EQ(tally.charged()[0].culprit, (ledger::Culprit{.user = 1000, .process = "player", .application = {}}));
+    EXPECT_EQ(tally.charged()[0].count, 1U);
+}
+
 TEST_P(EventKeeperContract, RemovesWhatIsTooOld)
 {
     configuration.maximumAgeDays = 10;

@@ -155,16 +155,18 @@ void AnalyticsStore::finish()
 std::size_t AnalyticsStore::giveUp()
 {
     ledger::Tally tally;
-    std::size_t events = 0;
     {
         const foundation::Lock lock(lock_);
         tally.takeFrom(waiting_.tally);
-        tally.add(Counter::Events, eventsInWriting_);
-        events = waiting_.events.size() + eventsInWriting_;
+        if (inWriting_ != nullptr) {
+            tally.add(Counter::Events, inWriting_->size());
+            origins_.countLoss(Counter::LostToEnd, inWriting_->eventsByOrigin(), tally);
+        }
+        origins_.begin(waiting_.events.announcements());
+        origins_.countLoss(Counter::LostToEnd, waiting_.events.eventsByOrigin(), tally);
     }
-    tally.add(Counter::LostToEnd, events);
     ledger_.post(tally);
-    return events;
+    return tally[Counter::LostToEnd];
 }
 
 // --- Between callers and the store's thread
@@ -277,7 +279,10 @@ bool AnalyticsStore::take(Batch& batch)
         std::swap(configuration, newConfiguration_);
         std::swap(batch, waiting_);
         isWriting_ = !batch.empty();
-        eventsInWriting_ = batch.events.size();
+        inWriting_ = &batch.events;
+        origins_.committed();
+        origins_.begin(batch.events.announcements());
+        origins_.end(batch.events.announcements());
         room_.notifyAll();
     }
     if (configuration)
@@ -301,7 +306,7 @@ bool AnalyticsStore::sleep()
 void AnalyticsStore::eventsAreKept()
 {
     const foundation::Lock lock(lock_);
-    eventsInWriting_ = 0;
+    inWriting_ = nullptr;
 }
 
 void AnalyticsStore::endBatch()

@@ -17,6 +17,7 @@
 #include "platform/linux/settings/WatchedTomlFile.h"
 #include "platform/linux/store/EventKeeper.h"
 #include "platform/linux/store/UsedEventNames.h"
+#include "platform/linux/store/tables/KnownOrigins.h"
 
 #include <chrono>
 #include <cstddef>
@@ -127,7 +128,9 @@ private:
     foundation::Condition room_; // the waiting batch was taken
     Batch waiting_ KESTO_GUARDED_BY(lock_);
     std::optional<AnalyticsConfiguration> newConfiguration_ KESTO_GUARDED_BY(lock_);
-    std::size_t eventsInWriting_ KESTO_GUARDED_BY(lock_) = 0;
+    const EventBatch* inWriting_ KESTO_GUARDED_BY(lock_) = nullptr; // until its events are kept or lost
+    // By the batches that were taken: for the end, which cannot ask a keeper whose disk hangs.
+    KnownOrigins origins_ KESTO_GUARDED_BY(lock_);
     bool isWriting_ KESTO_GUARDED_BY(lock_) = false; // until the callbacks of the batch have returned
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // so that only a caller that finds it asleep pays for waking it
     bool isKeeperAwake_ KESTO_GUARDED_BY(lock_) = false; // it wants an empty batch

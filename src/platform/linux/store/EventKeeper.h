@@ -17,7 +17,7 @@ namespace platform {
 
 // The store's thread calls its functions, unless said otherwise. The keeper is made on the thread that makes the store,
 // before the first call, and destroyed on the thread that destroys the store, after the last. It logs its own failures,
-// and counts in the tally that it gets: events kept, lost and removed.
+// and counts in the tally that it gets: events kept, lost and removed, and by whose doing.
 class EventKeeper {
 public:
     EventKeeper() = default;
@@ -34,7 +34,7 @@ public:
     virtual void open() = 0;
     // Keeps all the events, in their order, or none. When it returns, they are kept or counted as lost. A payload that
     // JSON cannot express is lost alone. The batch may be empty: when the store is quiet, when a configuration changed,
-    // and when only callers wait.
+    // and when only callers wait. Its events stay in it: another thread may look whose they are.
     virtual void keep(EventBatch& events, ledger::Tally& tally) = 0;
     // Whether some tidying waits until the store is quiet.
     [[nodiscard]] virtual bool awaitsQuiet() const = 0;

@@ -177,12 +177,8 @@ SqliteEventFile::Expected<SqliteEventFile::Resolved> SqliteEventFile::resolve(co
     if (lastResolved_ && lastResolved_->origin == origin)
         return *lastResolved_;
     EventHolder holder;
-    if (const auto* source = origins_.sources.find(origin.source)) {
-        holder.user = source->begin.userIdentifier;
-        holder.process = source->begin.processName;
-        if (const auto* session = origins_.sessions.find(origin.session))
-            holder.application = session->begin.application;
-    }
+    if (auto culprit = origins_.culpritOf(origin))
+        holder = {culprit->user, std::move(culprit->process), std::move(culprit->application)};
     const auto id = holders_.idOf(std::move(holder), counts_.counts().nextEvent);
     if (!id)
         return std::unexpected(id.error());
@@ -312,7 +308,8 @@ SqliteEventFile::Expected<SqliteEventFile::Size> SqliteEventFile::size()
                 .freeBytes = static_cast<std::uint64_t>(*free) * pageSize_};
 }
 
-SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOlderThan(double seconds, std::uint64_t most)
+SqliteEventFile::Expected<SqliteEventFile::EventsByHolder> SqliteEventFile::deleteOlderThan(double seconds,
+                                                                                            std::uint64_t most)
 {
     AgeClock now = *ageClock_;
     if (now.advance()) // events are older than it seemed
@@ -340,11 +337,12 @@ SqliteEventFile::Expected<std::uint64_t> SqliteEventFile::deleteOlderThan(double
     if (doomed.empty()) {
         if (const auto done = ages_.forget(*below); *below != 0 && !done)
             return std::unexpected(done.error());
-        return 0;
+        return EventsByHolder();
     }
+    EventsByHolder events = eventsByHolder(doomed); // a holder may go with its last message
     if (const auto done = remove(doomed); !done)
         return std::unexpected(done.error());
-    return eventsOf(doomed);
+    return events;
 }
 
 SqliteEventFile::Expected<SqliteEventFile::Removal> SqliteEventFile::deleteOfLargestHolder(std::uint64_t bytes,
@@ -404,6 +402,17 @@ std::uint64_t SqliteEventFile::eventsOf(const std::vector<Doomed>& doomed)
     for (const Doomed& message : doomed)
         events += message.events;
     return static_cast<std::uint64_t>(events);
+}
+
+SqliteEventFile::EventsByHolder SqliteEventFile::eventsByHolder(const std::vector<Doomed>& doomed) const
+{
+    std::map<std::int64_t, std::uint64_t> byId;
+    for (const Doomed& message : doomed)
+        byId[message.holder] += static_cast<std::uint64_t>(message.events);
+    EventsByHolder events;
+    for (const auto& [id, count] : byId)
+        events[holders_.holderOf(id)] += count;
+    return events;
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::remove(const std::vector<Doomed>& doomed)

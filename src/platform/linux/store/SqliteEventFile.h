@@ -20,6 +20,7 @@
 #include <chrono>
 #include <cstdint>
 #include <filesystem>
+#include <map>
 #include <memory>
 #include <optional>
 #include <span>
@@ -74,9 +75,10 @@ public:
         std::uint64_t freeBytes = 0; // room in the file that no event uses
     };
     [[nodiscard]] Expected<Size> size();
+    using EventsByHolder = std::map<EventHolder, std::uint64_t>;
     // Deletes messages that were kept so many seconds ago or earlier, at most `most`. Returns how many events they
-    // were.
-    [[nodiscard]] Expected<std::uint64_t> deleteOlderThan(double seconds, std::uint64_t most);
+    // were, and whose.
+    [[nodiscard]] Expected<EventsByHolder> deleteOlderThan(double seconds, std::uint64_t most);
     struct Removal {
         std::uint64_t events = 0;
         EventHolder holder;
@@ -122,6 +124,7 @@ private:
     [[nodiscard]] Expected<Resolved> resolve(const Origin& origin);
     [[nodiscard]] Expected<Doomed> look(std::int64_t id);
     [[nodiscard]] static std::uint64_t eventsOf(const std::vector<Doomed>& doomed);
+    [[nodiscard]] EventsByHolder eventsByHolder(const std::vector<Doomed>& doomed) const;
     [[nodiscard]] Expected<> remove(const std::vector<Doomed>& doomed);
 
     const std::filesystem::path path_;

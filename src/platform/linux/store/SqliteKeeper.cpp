@@ -24,6 +24,14 @@ bool hasContent(const fs::path& file)
     return fs::file_size(file, error) > 0 && !error;
 }
 
+std::uint64_t countOf(std::span<const EventRow> rows)
+{
+    std::uint64_t events = 0;
+    for (const EventRow& row : rows)
+        events += row.events();
+    return events;
+}
+
 // Empty where the kernel does not say it.
 std::string bootIdentifier()
 {
@@ -149,10 +157,7 @@ void SqliteKeeper::keep(EventBatch& events, ledger::Tally& tally)
         return;
     origins_.begin(events.announcements());
     const auto rows = events.rows();
-    std::uint64_t count = 0;
-    for (const EventRow& row : rows)
-        count += row.events();
-    lose(StoreError::NotJson, events.size() - count, tally);
+    lose(StoreError::NotJson, events.rowsWithoutJson(), tally);
     const OriginAnnouncements& announced = events.announcements();
     if (rows.empty() && !endsRows(announced))
         return losses_.report();
@@ -161,16 +166,18 @@ void SqliteKeeper::keep(EventBatch& events, ledger::Tally& tally)
         done = write(rows, announced); // now into another database
     origins_.end(announced); // also where nothing could be written
     if (done)
-        tally.add(ledger::Counter::Kept, count);
+        tally.add(ledger::Counter::Kept, countOf(rows));
     else
-        lose(done.error(), count, tally);
+        lose(done.error(), rows, tally);
     losses_.report();
 }
 
-void SqliteKeeper::lose(StoreError reason, std::uint64_t events, ledger::Tally& tally)
+void SqliteKeeper::lose(StoreError reason, std::span<const EventRow> rows, ledger::Tally& tally)
 {
-    losses_.add(reason, events);
-    tally.add(counterOf(reason), events);
+    if (rows.empty())
+        return;
+    losses_.add(reason, countOf(rows));
+    origins_.countLoss(counterOf(reason), eventsByOrigin(rows), tally);
 }
 
 std::optional<ledger::StoreState> SqliteKeeper::state() const
@@ -387,32 +394,33 @@ bool SqliteKeeper::makeRoom(ledger::Tally& tally)
     return size.has_value();
 }
 
-void SqliteKeeper::count(const SqliteEventFile::Removal& removal, ledger::Tally& tally)
+void SqliteKeeper::count(ledger::Counter reason, const EventHolder& holder, std::uint64_t events, ledger::Tally& tally)
 {
-    using enum ledger::Counter;
-    const auto& [user, process, application] = removal.holder;
-    (removal.isOnlyHolder ? removals_.removed().forSize : removals_.removed().forShare) += removal.events;
-    const ledger::Counter counter = removal.isOnlyHolder ? RemovedForSize : RemovedForShare;
+    const auto& [user, process, application] = holder;
     if (user)
-        tally.add(counter, ledger::Culprit{*user, process, application}, removal.events);
+        tally.add(reason, ledger::Culprit{*user, process, application}, events);
     else
-        tally.add(counter, removal.events);
+        tally.add(reason, events);
 }
 
 // False if nothing is left to do.
 SqliteKeeper::Expected<bool> SqliteKeeper::makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally)
 {
+    using enum ledger::Counter;
     const auto aged = database_->deleteOlderThan(configuration_.maximumAgeDays * secondsADay, eventsDeletedAtOnce);
     if (!aged)
         return std::unexpected(aged.error());
-    tally.add(ledger::Counter::RemovedForAge, *aged);
-    removals_.removed().forAge += *aged;
-    bool hasRemoved = *aged > 0;
+    for (const auto& [holder, events] : *aged) {
+        removals_.removed().forAge += events;
+        count(RemovedForAge, holder, events, tally);
+    }
+    bool hasRemoved = !aged->empty();
     if (!hasRemoved && size.usedBytes > maximumBytes()) {
         const auto removal = database_->deleteOfLargestHolder(size.usedBytes - maximumBytes(), eventsDeletedAtOnce);
         if (!removal)
             return std::unexpected(removal.error());
-        count(*removal, tally);
+        (removal->isOnlyHolder ? removals_.removed().forSize : removals_.removed().forShare) += removal->events;
+        count(removal->isOnlyHolder ? RemovedForSize : RemovedForShare, removal->holder, removal->events, tally);
         hasRemoved = !removal->isDone;
     }
     oldest_ = database_->oldest().value_or(0);

@@ -72,11 +72,11 @@ private:
     [[nodiscard]] Expected<> write(std::span<const EventRow> rows, const OriginAnnouncements& announced);
     [[nodiscard]] bool endsRows(const OriginAnnouncements& announced);
     void handleFailure(StoreError error);
-    void lose(StoreError reason, std::uint64_t events, ledger::Tally& tally);
+    void lose(StoreError reason, std::span<const EventRow> rows, ledger::Tally& tally);
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     [[nodiscard]] bool isLogFull();
     bool emptyLog();
-    void count(const SqliteEventFile::Removal& removal, ledger::Tally& tally);
+    static void count(ledger::Counter reason, const EventHolder& holder, std::uint64_t events, ledger::Tally& tally);
     [[nodiscard]] bool moveFirstEdition(ledger::Tally& tally);
     [[nodiscard]] bool makeRoom(ledger::Tally& tally);
     [[nodiscard]] Expected<bool> makeSomeRoom(const SqliteEventFile::Size& size, ledger::Tally& tally);

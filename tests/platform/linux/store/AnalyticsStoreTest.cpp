@@ -176,25 +176,27 @@ TEST_F(AnalyticsStoreTest, AnEventOutsideATurnIsKeptWithoutAnybodyAsking)
     EXPECT_EQ(storedEvents(), 1);
 }
 
+// Keeps the first events only when it may go on.
+class SlowKeeper final : public support::MemoryKeeper {
+public:
+    using MemoryKeeper::MemoryKeeper;
+    void keep(EventBatch& events, ledger::Tally& tally) override
+    {
+        if (events.size() != 0 && !std::exchange(wasSlow_, true)) {
+            isKeeping.set_value();
+            goesOn.get_future().wait();
+        }
+        MemoryKeeper::keep(events, tally);
+    }
+    std::promise<void> isKeeping;
+    std::promise<void> goesOn;
+
+private:
+    bool wasSlow_ = false;
+};
+
 TEST_F(AnalyticsStoreTest, CountsTheEventsThatItGivesUp)
 {
-    class SlowKeeper final : public support::MemoryKeeper {
-    public:
-        using MemoryKeeper::MemoryKeeper;
-        void keep(EventBatch& events, ledger::Tally& tally) override
-        {
-            if (events.size() != 0 && !std::exchange(wasSlow_, true)) {
-                isKeeping.set_value();
-                goesOn.get_future().wait();
-            }
-            MemoryKeeper::keep(events, tally);
-        }
-        std::promise<void> isKeeping;
-        std::promise<void> goesOn;
-
-    private:
-        bool wasSlow_ = false;
-    };
     auto slow = std::make_unique<SlowKeeper>(std::make_shared<support::KeptEvents>(), clock);
     SlowKeeper& keeper = *slow;
     AnalyticsStore tested(std::move(slow), watcher, clock, ledger, ProviderLog(log), limits);
@@ -212,6 +214,61 @@ TEST_F(AnalyticsStoreTest, CountsTheEventsThatItGivesUp)
     keeper.goesOn.set_value();
     tested.flush();
     EXPECT_EQ(tested.giveUp(), 0U);
+}
+
+TEST_F(AnalyticsStoreTest, ChargesWhatItGivesUpAlsoToThoseWhoCameSinceItsThreadHangs)
+{
+    auto slow = std::make_unique<SlowKeeper>(std::make_shared<support::KeptEvents>(), clock);
+    SlowKeeper& keeper = *slow;
+    AnalyticsStore tested(std::move(slow), watcher, clock, ledger, ProviderLog(log), limits);
+    const auto sendFrom = [&](std::uint64_t source) {
+        tested.sendAnalyticsEventLazy(outsideTurn, {.source = source, .session = 0}, eventName,
+                                      [] { return Dictionary(); });
+    };
+    const auto begin = [&](std::uint64_t source, const char* process) {
+        Turn turn;
+        turn.events.announce(SourceBegin{.number = source, .userIdentifier = 1000, .processName = process});
+        tested.endTurn(turn, nullptr);
+    };
+    begin(7, "player");
+    tested.flush();
+    sendFrom(7);
+    keeper.isKeeping.get_future().wait();
+    sendFrom(7);
+    begin(8, "recorder");
+    sendFrom(8);
+    sendFrom(99);
+    EXPECT_EQ(tested.giveUp(), 4U);
+    keeper.goesOn.set_value();
+    const auto lost = ledger.account().culprits[static_cast<std::size_t>(ledger::Charge::Lost)];
+    ASSERT_EQ(lost.size(), 2U);
+    EXPECT_EQ(lost[0].culprit, (ledger::Culprit{.user = 1000, .process = "player", .application = {}}));
+    EXPECT_EQ(lost[0].count, 2U) << "one is being kept, and one waits";
+    EXPECT_EQ(lost[1].culprit, (ledger::Culprit{.user = 1000, .process = "recorder", .application = {}}));
+    EXPECT_EQ(lost[1].count, 1U);
+}
+
+TEST_F(AnalyticsStoreTest, ForgetsWhoEndedLongAgo)
+{
+    auto slow = std::make_unique<SlowKeeper>(std::make_shared<support::KeptEvents>(), clock);
+    SlowKeeper& keeper = *slow;
+    AnalyticsStore tested(std::move(slow), watcher, clock, ledger, ProviderLog(log), limits);
+    Turn turn;
+    for (std::uint64_t source = 1; source <= 1025; ++source) {
+        turn.events.announce(SourceBegin{.number = source, .userIdentifier = 1000, .processName = "player"});
+        turn.events.announceSourceEnd({.number = source, .time = 2});
+    }
+    tested.endTurn(turn, nullptr);
+    tested.flush();
+    for (const std::uint64_t source : {1U, 2U})
+        tested.sendAnalyticsEventLazy(turn, {.source = source, .session = 0}, eventName, [] { return Dictionary(); });
+    tested.endTurn(turn, nullptr);
+    keeper.isKeeping.get_future().wait();
+    EXPECT_EQ(tested.giveUp(), 2U);
+    keeper.goesOn.set_value();
+    const auto lost = ledger.account().culprits[static_cast<std::size_t>(ledger::Charge::Lost)];
+    ASSERT_EQ(lost.size(), 1U) << "of the second, which is still remembered";
+    EXPECT_EQ(lost[0].count, 1U);
 }
 
 TEST_F(AnalyticsStoreTest, ReportsItsLossesWithoutItsThread)

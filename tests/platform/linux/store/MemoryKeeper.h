@@ -4,6 +4,7 @@
 #include "foundation/Mutex.h"
 #include "platform/Clock.h"
 #include "platform/linux/store/EventKeeper.h"
+#include "platform/linux/store/tables/KnownOrigins.h"
 
 #include <memory>
 #include <string>
@@ -60,7 +61,8 @@ public:
                     given.push_back({row.time, std::string(name), std::string(row.payload)});
         place_->change([&](std::vector<KeptEvent>& kept) { kept.insert(kept.end(), given.begin(), given.end()); });
         tally.add(ledger::Counter::Kept, given.size());
-        tally.add(ledger::Counter::LostNotJson, events.size() - given.size());
+        origins_.begin(events.announcements());
+        origins_.countLoss(ledger::Counter::LostNotJson, eventsByOrigin(events.rowsWithoutJson()), tally);
     }
     [[nodiscard]] bool awaitsQuiet() const override { return false; }
     bool tidy(bool, ledger::Tally& tally) override
@@ -96,6 +98,7 @@ private:
     const std::shared_ptr<KeptEvents> place_;
     const platform::Clock& clock_;
     platform::AnalyticsConfiguration configuration_;
+    platform::KnownOrigins origins_;
 };
 
 } // namespace support

@@ -5,6 +5,7 @@
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/store/ManualClock.h"
 #include "platform/linux/store/StoreReader.h"
+#include "support/AnotherProcess.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
 
@@ -51,6 +52,7 @@ using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::SizeIs;
 using testing::StartsWith;
+using testing::UnorderedElementsAre;
 
 namespace fs = std::filesystem;
 
@@ -537,6 +539,30 @@ TEST_F(OriginsTest, AnotherRunOfTheServiceHasRowsOfItsOwn)
     EXPECT_THAT(sources(), SizeIs(2));
 }
 
+TEST_F(OriginsTest, WhatIsTooOldIsChargedToWhoSentIt)
+{
+    configuration.maximumAgeDays = 10;
+    begin(7);
+    beginSession(9, 7);
+    begin(8, "recorder", 1001);
+    for (int number = 1; number <= 3; ++number)
+        add({.source = 7, .session = 9}, number);
+    add({.source = 8, .session = 0}, 4);
+    add({}, 5);
+    keepBatch();
+    clock.advance(11 * day);
+    maintain();
+    EXPECT_EQ(tally[ledger::Counter::RemovedForAge], 5U);
+    const auto isOf = [](const ledger::Culprit& culprit, std::uint64_t count) {
+        using ledger::Tally;
+        return AllOf(Field(&Tally::Charged::charge, ledger::Charge::Removed), Field(&Tally::Charged::culprit, culprit),
+                     Field(&Tally::Charged::count, count));
+    };
+    EXPECT_THAT(tally.charged(),
+                UnorderedElementsAre(isOf({.user = 1000, .process = "player", .application = "org.example.a"}, 3),
+                                     isOf({.user = 1001, .process = "recorder", .application = ""}, 1)));
+}
+
 TEST_F(OriginsTest, ThoseThatEndedLongAgoAreForgotten)
 {
     begin(7);
@@ -702,26 +728,9 @@ TEST_F(SqliteKeeperTest, ASecondServiceInTheSameDirectoryDoesNotWrite)
 
 // --- Disks that fail
 
-// Runs the test as an ordinary user, in a separate process, because a process cannot get privileges back.
-template <typename Test> void runUnprivileged(const fs::path& owned, Test test)
-{
-    const pid_t child = ::fork();
-    if (child == 0) {
-        constexpr unsigned nobody = 65534;
-        const bool isOrdinary = ::getuid() != 0
-            || (::chown(owned.c_str(), nobody, nobody) == 0 && ::setgid(nobody) == 0 && ::setuid(nobody) == 0);
-        if (isOrdinary)
-            test();
-        ::_exit(!isOrdinary ? 2 : testing::Test::HasFailure() ? 1 : 0);
-    }
-    int status = 0;
-    ASSERT_EQ(::waitpid(child, &status, 0), child);
-    EXPECT_EQ(status, 0);
-}
-
 TEST_F(SqliteKeeperTest, AReadOnlyDirectoryLosesEventsAndRecovers)
 {
-    runUnprivileged(directory, [this] {
+    support::runUnprivileged(directory, [this] {
         ::chmod(directory.c_str(), 0555);
         keep({event(1), event(2)});
         EXPECT_EQ(lost(StoreError::CannotOpen), 2U);
@@ -740,7 +749,7 @@ TEST_F(SqliteKeeperTest, AReadOnlyDirectoryLosesEventsAndRecovers)
 
 TEST_F(SqliteKeeperTest, AReadOnlyDatabaseLosesEventsAndRecovers)
 {
-    runUnprivileged(directory, [this] {
+    support::runUnprivileged(directory, [this] {
         keep({event(1)});
         closeWriter();
         ::chmod(file().c_str(), 0444);
@@ -812,8 +821,7 @@ TEST_F(SqliteKeeperTest, AFullDiskLosesEventsAndRecoversWhenThereIsRoom)
 
 TEST_F(SqliteKeeperTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
 {
-    const pid_t child = ::fork();
-    if (child == 0) {
+    support::runInAnotherProcess([this] {
         ::signal(SIGXFSZ, SIG_IGN);
         rlimit limit{};
         ::getrlimit(RLIMIT_FSIZE, &limit);
@@ -829,11 +837,7 @@ TEST_F(SqliteKeeperTest, AFileThatMayNotGrowLosesEventsAndTheServiceGoesOn)
         keep(events(200));
         EXPECT_EQ(tally[ledger::Counter::Kept], before + 200);
         EXPECT_EQ(StoreReader(file()).eventCount(), static_cast<std::int64_t>(before + 200));
-        ::_exit(HasFailure() ? 1 : 0);
-    }
-    int status = 0;
-    ASSERT_EQ(::waitpid(child, &status, 0), child);
-    EXPECT_EQ(status, 0);
+    });
 }
 
 TEST_F(SqliteKeeperTest, ADiskThatFailsLosesEventsUntilTheDatabaseIsOpenedAnew)

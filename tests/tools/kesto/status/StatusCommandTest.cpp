@@ -1,6 +1,9 @@
 // What a real service counted, from a shell: while it runs, after it ended, and when there is nothing to read.
 #include "end_to_end/Kestod.h"
+#include "end_to_end/SmallDisk.h"
+#include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
+#include "support/AnotherProcess.h"
 #include "tools/kesto/Tool.h"
 
 #include <algorithm>
@@ -10,6 +13,7 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <rapidjson/document.h>
+#include <sys/prctl.h>
 #include <unistd.h>
 
 namespace kesto_tool {
@@ -60,6 +64,29 @@ protected:
         client.call(end_to_end::Start, 1);
         client.ask(end_to_end::SendMessage, Dictionary{{"a", std::nan("")}}, 4, 1, Array{1});
     }
+    // Another user's process of that name sends more than a full disk takes.
+    void overfillAs(const char* name) const
+    {
+        support::runInAnotherProcess([&] {
+            ASSERT_EQ(::setgid(stranger), 0);
+            ASSERT_EQ(::setuid(stranger), 0);
+            ASSERT_EQ(::prctl(PR_SET_NAME, name), 0);
+            end_to_end::WireClient client(kestod.socketPath());
+            client.ask(end_to_end::Create, 2);
+            client.ask(end_to_end::SetConfiguration, Dictionary{{"HostApplicationDisplayID", "org.example.a"}}, 2);
+            client.call(end_to_end::Start, 2);
+            client.ask(end_to_end::Validate, 2);
+            for (int number = 0; number < 100; ++number)
+                client.ask(end_to_end::SendMessage, Dictionary{{"n", number}, {"text", std::string(4000, 'x')}}, 4, 1,
+                           Array{2});
+        });
+    }
+    void letStrangersIn() const
+    {
+        for (const char* folder : {"", "run"})
+            fs::permissions(kestod.directory() / folder, fs::perms(0755));
+        fs::permissions(kestod.socketPath(), fs::perms(0666));
+    }
     [[nodiscard]] fs::path ledgerFile() const { return kestod.directory() / "state" / "analytics.ledger"; }
     [[nodiscard]] rapidjson::Document json(int exitStatus) const
     {
@@ -72,6 +99,7 @@ protected:
         return document;
     }
 
+    static constexpr unsigned stranger = 65534;
     end_to_end::Kestod kestod;
     Tool tool{kestod.directory()};
 };
@@ -124,6 +152,39 @@ TEST_F(StatusCommand, SaysWhoseMessagesWereRefused)
     EXPECT_STREQ(who["process"].GetString(), "kesto_tool_test");
     EXPECT_EQ(who["count"].GetUint64(), status["refused"]["size"].GetUint64());
     EXPECT_THAT(tool.run({"status"}).output, HasSubstr("  kesto_tool_test"));
+}
+
+TEST_F(StatusCommand, SaysWhoseEventsWereLostToThoseWhoMayKnow)
+{
+    const end_to_end::SmallDisk disk(kestod.directory() / "state");
+    if (!disk.isMounted())
+        GTEST_SKIP() << "needs the right to mount";
+    kestod.startAndAwait();
+    letStrangersIn();
+    loseAnEvent();
+    EXPECT_TRUE(end_to_end::waitUntil([&] { return kestod.events("*uptime").size() == 2; })) << "of all clients so far";
+    disk.fill();
+    overfillAs("recorder");
+    disk.makeRoom();
+
+    const auto status = json(1);
+    const std::uint64_t lostToDisk = status["lost"]["diskFull"].GetUint64();
+    EXPECT_GT(lostToDisk, 0U);
+    EXPECT_EQ(status["lost"]["notJson"].GetUint64(), 2U);
+    EXPECT_EQ(end_to_end::readLedger(kestod).sum(ledger::Charge::Lost), lostToDisk + 2);
+    const auto& lost = status["who"]["lost"];
+    ASSERT_EQ(lost.Size(), 2U) << "and no rest";
+    EXPECT_EQ(lost[0]["user"].GetUint(), stranger);
+    EXPECT_STREQ(lost[0]["process"].GetString(), "recorder");
+    EXPECT_STREQ(lost[0]["application"].GetString(), "org.example.a");
+    EXPECT_EQ(lost[0]["count"].GetUint64(), lostToDisk);
+    EXPECT_EQ(lost[1]["user"].GetUint(), ::geteuid());
+    EXPECT_STREQ(lost[1]["process"].GetString(), "kesto_tool_test");
+    EXPECT_EQ(lost[1]["count"].GetUint64(), 2U);
+
+    tool.giveUpRights();
+    EXPECT_FALSE(json(1).HasMember("who"));
+    kestod.kill();
 }
 
 TEST_F(StatusCommand, AfterARestartIsHealthyAgainAndStillKnowsTheLoss)
@@ -196,9 +257,7 @@ TEST_F(StatusCommand, ToAStrangerDoesNotSayWhoDidIt)
         GTEST_SKIP() << "only root can become another user";
     kestod.startAndAwait();
     sendTooMuch();
-    for (const char* folder : {"", "run"})
-        fs::permissions(kestod.directory() / folder, fs::perms(0755));
-    fs::permissions(kestod.socketPath(), fs::perms(0666));
+    letStrangersIn();
     tool.giveUpRights();
     const auto status = json(1);
     EXPECT_GT(status["refused"]["size"].GetUint64(), 0U);

@@ -50,6 +50,12 @@ StoreExpected<> EventHolders::load()
     }
 }
 
+EventHolder EventHolders::holderOf(std::int64_t id) const
+{
+    const auto found = std::ranges::find(ids_, id, [](const auto& known) { return known.second; });
+    return found == ids_.end() ? EventHolder() : found->first;
+}
+
 StoreExpected<std::int64_t> EventHolders::idOf(EventHolder holder, std::int64_t nextEvent)
 {
     if (const auto known = ids_.find(holder); known != ids_.end())

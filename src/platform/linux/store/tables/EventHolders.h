@@ -47,6 +47,8 @@ public:
 
     [[nodiscard]] static StoreExpected<EventHolders> open(SqliteConnection& connection);
 
+    // Whose ID that is; one that is not known, if there is none.
+    [[nodiscard]] EventHolder holderOf(std::int64_t id) const;
     // The ID of the holder, or of the one that it counts with.
     [[nodiscard]] StoreExpected<std::int64_t> idOf(EventHolder holder, std::int64_t nextEvent);
     void add(std::int64_t id, std::size_t payloadBytes);

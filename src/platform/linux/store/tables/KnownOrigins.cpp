@@ -31,6 +31,26 @@ void KnownOrigins::rolledBack()
     sessions.rolledBack();
 }
 
+std::optional<ledger::Culprit> KnownOrigins::culpritOf(const Origin& origin)
+{
+    const auto* const source = sources.find(origin.source);
+    if (source == nullptr)
+        return std::nullopt;
+    const auto* const session = sessions.find(origin.session);
+    return ledger::Culprit{.user = source->begin.userIdentifier,
+                           .process = source->begin.processName,
+                           .application = session == nullptr ? std::string() : session->begin.application};
+}
+
+void KnownOrigins::countLoss(ledger::Counter reason, const EventsByOrigin& events, ledger::Tally& tally)
+{
+    for (const auto& [origin, count] : events)
+        if (const auto culprit = culpritOf(origin))
+            tally.add(reason, *culprit, count);
+        else
+            tally.add(reason, count);
+}
+
 bool KnownOrigins::hasChanged() const noexcept
 {
     return !sources.changed().empty() || !sessions.changed().empty();

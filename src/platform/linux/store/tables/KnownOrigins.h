@@ -3,8 +3,11 @@
 // A source or a session gets its row with its first event, so that clients that send nothing leave nothing. So each is
 // remembered as long as it lives; a few stay remembered after their end, since an event may come late, and since a new
 // database may be begun at any time.
+//
+// What they say is also whom the loss of an event is charged to.
 #pragma once
 
+#include "ledger/Tally.h"
 #include "platform/Origin.h"
 
 #include <algorithm>
@@ -120,6 +123,10 @@ struct KnownOrigins {
     void end(const OriginAnnouncements& announced);
     void committed();
     void rolledBack();
+    // Who is behind the origin; nothing if its source is not known.
+    [[nodiscard]] std::optional<ledger::Culprit> culpritOf(const Origin& origin);
+    // Counts the loss of events, and charges it to those who sent them as far as they are known.
+    void countLoss(ledger::Counter reason, const EventsByOrigin& events, ledger::Tally& tally);
     // Whether rows are to be written although there is no event.
     [[nodiscard]] bool hasChanged() const noexcept;
 };
