@@ -14,6 +14,7 @@ void measureGrowingSession(const BenchOptions& options, Report& report);
 void measureSessionEnd(const BenchOptions& options, Report& report);
 void measureEndedSessions(const BenchOptions& options, Report& report);
 void measureLongStop(const BenchOptions& options, Report& report);
+void measureNeighbours(const BenchOptions& options, Report& report);
 void measureStatusRequest(const BenchOptions& options, Report& report);
 void measureLookup(const BenchOptions& options, Report& report);
 void measureNotification(const BenchOptions& options, Report& report);

@@ -1,6 +1,7 @@
 // How long a client waits for the status while the service is busy: no other call may hold it up.
 #include "Groups.h"
 #include "support/ServiceProcess.h"
+#include "support/Waits.h"
 
 #include <algorithm>
 #include <array>
@@ -46,20 +47,6 @@ private:
     platform::FileDescriptor socket_;
     const std::string request_;
     std::string answer_;
-};
-
-struct Waits {
-    std::vector<double> median;
-    std::vector<double> percentile99;
-    std::vector<double> longest;
-
-    void add(std::vector<double> times)
-    {
-        constexpr double almostAll = 0.99;
-        median.push_back(bench::median(times));
-        percentile99.push_back(quantile(times, almostAll));
-        longest.push_back(std::ranges::max(times));
-    }
 };
 
 // The waits while the work runs on another thread.

@@ -29,6 +29,7 @@ constexpr std::array groups{
     MeasurementGroup{"end", "the end of a session of a million messages", measureSessionEnd},
     MeasurementGroup{"ended", "the memory that stays of sessions that ended", measureEndedSessions},
     MeasurementGroup{"starving", "what others wait while a long session ends", measureLongStop},
+    MeasurementGroup{"neighbours", "what a well-behaved client waits beside floods", measureNeighbours},
     MeasurementGroup{"status", "what a client waits for the status of a busy service", measureStatusRequest},
     MeasurementGroup{"lookup", "finding a session among 10,000 clients", measureLookup},
     MeasurementGroup{"notification", "telling all sessions that a setting changed", measureNotification},
@@ -45,10 +46,11 @@ constexpr std::array groups{
 
 void printHelp()
 {
-    fmt::print("Usage: kesto_bench [--filter TEXT] [--rounds N] [--json FILE] [--service PROGRAM]\n\n"
+    fmt::print("Usage: kesto_bench [--filter TEXT[/PART]] [--rounds N] [--json FILE] [--service PROGRAM]\n\n"
                "Measures Kesto reporting beside its peers and prints a table: the figure, the peer's figure from the\n"
                "same run, their ratio, the target. Every figure is the median of the rounds.\n\n"
-               "  --filter TEXT      only the groups with TEXT in their name\n"
+               "  --filter TEXT      only the groups with TEXT in their name; neighbours/PART: of this group only the\n"
+               "                     floods with PART in their name\n"
                "  --rounds N         rounds of each measurement, {} at least; {} by default\n"
                "  --json FILE        write all figures, round by round, to the file, too\n"
                "  --service PROGRAM  the service to measure; {} by default\n"
@@ -56,6 +58,13 @@ void printHelp()
                BenchOptions::fewestRounds, BenchOptions().rounds, KESTO_BENCH_SERVICE);
     for (const MeasurementGroup& group : groups)
         fmt::print("  {:<12} {}\n", group.name, group.what);
+}
+
+void takeFilter(std::string_view text, BenchOptions& options)
+{
+    const std::size_t slash = text.find('/');
+    options.filter = text.substr(0, slash);
+    options.part = slash == std::string_view::npos ? "" : text.substr(slash + 1);
 }
 
 // Nothing if the program must end now; `exitStatus` is then its exit status.
@@ -72,7 +81,7 @@ std::optional<BenchOptions> parse(int argumentCount, char** arguments, int& stat
     options.service = KESTO_BENCH_SERVICE;
     for (int given = 0; (given = ::getopt_long(argumentCount, arguments, "", known.data(), nullptr)) != -1;) {
         switch (given) {
-        case 'f': options.filter = optarg; break;
+        case 'f': takeFilter(optarg, options); break;
         case 'r': options.rounds = std::max(std::atoi(optarg), BenchOptions::fewestRounds); break;
         case 'j': options.json = optarg; break;
         case 's': options.service = std::filesystem::absolute(optarg); break;

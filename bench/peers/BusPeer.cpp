@@ -160,15 +160,26 @@ void BusClient::pipeline(std::size_t count)
 
 namespace {
 
+constexpr const char* busName = "org.freedesktop.DBus";
+constexpr std::size_t placeOfSerial = 8;
+
+// A call of the bus itself, without arguments.
+BusMessage busCall(sd_bus* bus, const char* member)
+{
+    sd_bus_message* call = nullptr;
+    check(::sd_bus_message_new_method_call(bus, &call, busName, "/org/freedesktop/DBus", busName, member));
+    return BusMessage(call);
+}
+
 // The bytes that sd-bus sends for a call, read at the other end of a socket.
-std::string encodedCall()
+template <typename MakeCall> std::string encoded(MakeCall makeCall)
 {
     const SocketPair sockets;
     const Bus bus = makeBus(::dup(sockets.client.get()));
     check(::sd_bus_start(bus.get()));
     writeAll(sockets.server.get(), fmt::format("DATA\r\nOK {:032x}\r\nAGREE_UNIX_FD\r\n", 1));
     std::uint64_t cookie = 0; // requesting it requests an answer
-    check(::sd_bus_send(bus.get(), sampleCall(bus.get(), numberMark).get(), &cookie));
+    check(::sd_bus_send(bus.get(), makeCall(bus.get()).get(), &cookie));
     check(::sd_bus_flush(bus.get()));
     std::array<char, 4096> bytes{};
     const auto count = ::read(sockets.server.get(), bytes.data(), bytes.size());
@@ -184,42 +195,72 @@ std::uint32_t integerAt(const char* bytes)
     return value;
 }
 
-// The size of an answer: a fixed head with the length of the body at 4 and that of the fields at 12, the fields up
-// to a multiple of 8, and the body.
+constexpr std::size_t sizeOfHead = 16;
+
+// A message has a fixed head with the length of the body at 4 and that of the fields at 12, the fields up to a multiple
+// of 8, and the body.
+std::size_t sizeAfterHead(const char* head)
+{
+    return (integerAt(head + 12) + 7) / 8 * 8 + integerAt(head + 4);
+}
+
 std::size_t readAnswer(int socket)
 {
-    std::array<char, 16> head{};
-    if (!readAll(socket, head.data(), head.size()))
-        throw std::runtime_error("the sd-bus server ended the connection");
-    const std::size_t rest = (integerAt(head.data() + 12) + 7) / 8 * 8 + integerAt(head.data() + 4);
-    std::string bytes(rest, '\0');
-    if (!readAll(socket, bytes.data(), rest))
-        throw std::runtime_error("the sd-bus server ended the connection");
-    return head.size() + rest;
+    std::array<char, sizeOfHead> head{};
+    bool isWhole = readAll(socket, head.data(), head.size());
+    std::string rest(isWhole ? sizeAfterHead(head.data()) : 0, '\0');
+    isWhole = isWhole && readAll(socket, rest.data(), rest.size());
+    if (!isWhole)
+        throw std::runtime_error("the D-Bus server ended the connection");
+    return head.size() + rest.size();
+}
+
+void authenticate(int socket)
+{
+    using namespace std::string_view_literals;
+    std::string user;
+    for (const char digit : fmt::to_string(::getuid()))
+        user += fmt::format("{:02x}", digit);
+    writeAll(socket, "\0"sv);
+    writeAll(socket, fmt::format("AUTH EXTERNAL {}\r\n", user));
+    for (char byte = 0; byte != '\n';) // "OK" and the server's identity
+        if (!readAll(socket, &byte, 1))
+            throw std::runtime_error("the D-Bus server refused the connection");
+    writeAll(socket, "BEGIN\r\n");
 }
 
 } // namespace
 
 RawClient makeRawBusClient(platform::FileDescriptor socket)
 {
-    using namespace std::string_view_literals;
-    std::string user;
-    for (const char digit : fmt::to_string(::getuid()))
-        user += fmt::format("{:02x}", digit);
-    writeAll(socket.get(), "\0"sv);
-    writeAll(socket.get(), fmt::format("AUTH EXTERNAL {}\r\n", user));
-    for (char byte = 0; byte != '\n';) // "OK" and the server's identity
-        if (!readAll(socket.get(), &byte, 1))
-            throw std::runtime_error("the sd-bus server refused the connection");
-    writeAll(socket.get(), "BEGIN\r\n");
-
-    constexpr std::size_t placeOfSerial = 8;
-    Request request = Request::marked(encodedCall(), std::endian::native);
+    authenticate(socket.get());
+    Request request =
+        Request::marked(encoded([](sd_bus* bus) { return sampleCall(bus, numberMark); }), std::endian::native);
     request.places.push_back(placeOfSerial);
     request.setNumber(numberMark);
     writeAll(socket.get(), request.bytes);
     const std::size_t answerSize = readAnswer(socket.get());
     return {std::move(socket), std::move(request), answerSize};
+}
+
+Request busIdentityRequest()
+{
+    return {encoded([](sd_bus* bus) { return busCall(bus, "GetId"); }), {placeOfSerial}, std::endian::native};
+}
+
+void joinBus(int socket)
+{
+    authenticate(socket);
+    writeAll(socket, encoded([](sd_bus* bus) { return busCall(bus, "Hello"); }));
+    readAnswer(socket);
+}
+
+std::optional<std::size_t> sizeOfBusMessage(std::string_view bytes)
+{
+    if (bytes.size() < sizeOfHead)
+        return std::nullopt;
+    const std::size_t size = sizeOfHead + sizeAfterHead(bytes.data());
+    return size <= bytes.size() ? std::optional(size) : std::nullopt;
 }
 
 Bus connectToBus(const std::filesystem::path& path)

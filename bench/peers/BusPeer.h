@@ -7,6 +7,8 @@
 
 #include <cstdint>
 #include <memory>
+#include <optional>
+#include <string_view>
 #include <systemd/sd-bus.h>
 
 namespace bench {
@@ -34,6 +36,13 @@ private:
 
 // The raw client, with a request that sd-bus encoded.
 [[nodiscard]] RawClient makeRawBusClient(platform::FileDescriptor socket);
+
+// A call that a message bus answers itself: for its identity.
+[[nodiscard]] Request busIdentityRequest();
+// Makes the connected socket one of the bus's clients.
+void joinBus(int socket);
+// The size of the first whole message in the bytes; nothing if none is whole.
+[[nodiscard]] std::optional<std::size_t> sizeOfBusMessage(std::string_view bytes);
 
 // Connects to a message bus that listens at the path, as one of its clients; null if it does not answer.
 [[nodiscard]] Bus connectToBus(const std::filesystem::path& path);

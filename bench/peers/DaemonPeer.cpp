@@ -35,4 +35,13 @@ Bus DaemonPeer::connect() const
     throw std::runtime_error("dbus-daemon does not run");
 }
 
+platform::FileDescriptor DaemonPeer::connectSocket() const
+{
+    auto socket = connectTo(directory_.path() / "bus");
+    if (!socket)
+        throw std::runtime_error("dbus-daemon does not take another client");
+    joinBus(socket.get());
+    return socket;
+}
+
 } // namespace bench

@@ -1,4 +1,4 @@
-// dbus-daemon as a peer for the cost of an idle service and for the time to start.
+// dbus-daemon as a peer for the cost of an idle service, for the time to start, and for what a flood costs others.
 #pragma once
 
 #include "peers/BusPeer.h"
@@ -16,6 +16,8 @@ public:
     [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
     // Waits until it answers a client.
     [[nodiscard]] Bus connect() const;
+    // The socket of another client, for raw messages; the daemon answers already.
+    [[nodiscard]] platform::FileDescriptor connectSocket() const;
 
 private:
     support::TemporaryDirectory directory_;

@@ -6,6 +6,7 @@
 #include <chrono>
 #include <csignal>
 #include <cstdlib>
+#include <ctime>
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <fstream>
@@ -134,6 +135,15 @@ double contextSwitches(pid_t process)
         count += sumIn(fmt::format("/proc/{}/task/{}/status", process, thread),
                        {"voluntary_ctxt_switches", "nonvoluntary_ctxt_switches"});
     return count;
+}
+
+double processorSeconds(pid_t process)
+{
+    clockid_t clock{};
+    timespec time{};
+    if (::clock_getcpuclockid(process, &clock) != 0 || ::clock_gettime(clock, &time) != 0)
+        return 0;
+    return static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) / 1e9;
 }
 
 double residentMegabytes(pid_t process)

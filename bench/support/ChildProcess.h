@@ -51,8 +51,10 @@ private:
     std::vector<pid_t> processes_;
 };
 
-// The kernel's counts: how often threads of the process stopped running, and its memory.
+// The kernel's counts: how often threads of the process stopped running, the processor time of all its threads, and its
+// memory.
 [[nodiscard]] double contextSwitches(pid_t process);
+[[nodiscard]] double processorSeconds(pid_t process);
 [[nodiscard]] double residentMegabytes(pid_t process);
 
 } // namespace bench

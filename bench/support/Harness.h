@@ -21,6 +21,7 @@ struct BenchOptions {
     static constexpr int fewestRounds = 5;
     int rounds = 7;
     std::string filter; // only groups with this text in their names are measured
+    std::string part; // of a group that has named parts only those with this text in their names
     std::filesystem::path service; // the program kestod
     std::filesystem::path json; // where the results are written, unless it is empty
 };

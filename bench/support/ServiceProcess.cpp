@@ -18,7 +18,8 @@ constexpr std::string_view socketName = "kesto";
 
 } // namespace
 
-ServiceProcess::ServiceProcess(const BenchOptions& options, std::string_view analytics, Build build)
+ServiceProcess::ServiceProcess(const BenchOptions& options, std::string_view analytics, Build build,
+                               const Extras& extras)
 {
     const auto& root = directory_.path();
     std::vector<std::string> environment{fmt::format("KESTO_SERVICE_NAME={}", socketName)};
@@ -29,12 +30,21 @@ ServiceProcess::ServiceProcess(const BenchOptions& options, std::string_view ana
     std::ofstream(root / "CONFIGURATION" / "analytics.toml") << analytics << '\n';
     std::ofstream(root / "CONFIGURATION" / "device.toml")
         << "InternalBuild = " << (build == Build::Internal ? "true" : "false") << '\n';
+    std::ofstream(root / "CONFIGURATION" / "feature-flags.toml") << extras.featureFlags;
+    if (!extras.channelRoot.empty())
+        environment.push_back(fmt::format("KESTO_CHANNEL_ROOT={}", extras.channelRoot.native()));
     process_ = ChildProcess::execute({options.service}, environment, root / "log");
 }
 
 std::filesystem::path ServiceProcess::socketPath() const
 {
     return directory_.path() / "RUNTIME" / socketName;
+}
+
+void ServiceProcess::admitOtherUsers() const
+{
+    std::filesystem::permissions(directory_.path(), std::filesystem::perms::others_exec,
+                                 std::filesystem::perm_options::add);
 }
 
 platform::FileDescriptor ServiceProcess::connect() const

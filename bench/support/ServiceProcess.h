@@ -17,12 +17,20 @@ class ServiceProcess {
 public:
     enum class Build : std::uint8_t { Customer, Internal };
 
+    // What only some measurements need.
+    struct Extras {
+        std::string_view featureFlags; // the content of feature-flags.toml
+        std::filesystem::path channelRoot; // where the channels are, unless it is empty
+    };
+
     // `analytics` is the content of analytics.toml. Returns before the service listens.
     explicit ServiceProcess(const BenchOptions& options, std::string_view analytics = "used = []",
-                            Build build = Build::Customer);
+                            Build build = Build::Customer, const Extras& extras = {});
 
     [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
     [[nodiscard]] std::filesystem::path socketPath() const;
+    // Lets programs of other users reach the socket.
+    void admitOtherUsers() const;
     // Waits until the service listens.
     [[nodiscard]] platform::FileDescriptor connect() const;
     // A connection with the sample session on it, started.

@@ -1,0 +1,58 @@
+// The root is a link, so that one step exchanges the trees. Both have channels in every group.
+#include "neighbours/ChannelCrowd.h"
+
+#include <array>
+#include <fmt/format.h>
+#include <fstream>
+#include <string_view>
+
+namespace bench {
+namespace {
+
+namespace fs = std::filesystem;
+
+constexpr int channelCount = 4096;
+constexpr int folderCount = 65'000;
+constexpr std::array<std::string_view, 8> groups{
+    "QuarnZT4/-", "Speaker/-", "-/MCA", "Haptics/Stats", "StateTransitionTimes_ms/-", "Rx/-", "Tx/-", "-/HwAudio2"};
+
+// The driver stands before the folders in the order of names.
+void makeChannels(const fs::path& tree, int countEach)
+{
+    for (const std::string_view group : groups) {
+        const fs::path folder = tree / "amp" / group;
+        fs::create_directories(folder);
+        for (int channel = 0; channel < countEach; ++channel)
+            std::ofstream(folder / fmt::format("channel {:04}", channel)) << "simple\n" << channel << '\n';
+    }
+}
+
+void makeFolders(const fs::path& tree)
+{
+    for (int folder = 0; folder < folderCount; ++folder)
+        fs::create_directory(tree / fmt::format("folder {:05}", folder));
+}
+
+} // namespace
+
+ChannelCrowd::ChannelCrowd() : few_(directory_.path() / "few"), many_(directory_.path() / "many")
+{
+    makeChannels(few_, 1);
+    makeChannels(many_, channelCount / static_cast<int>(groups.size()));
+    makeFolders(many_);
+    showFew();
+}
+
+fs::path ChannelCrowd::root() const
+{
+    return directory_.path() / "root";
+}
+
+void ChannelCrowd::show(const fs::path& tree) const
+{
+    const fs::path link = directory_.path() / "link";
+    fs::create_directory_symlink(tree, link);
+    fs::rename(link, root());
+}
+
+} // namespace bench
