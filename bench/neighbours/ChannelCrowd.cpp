@@ -1,4 +1,5 @@
-// The root is a link, so that one step exchanges the trees. Both have channels in every group.
+// The root is a link, so that one step exchanges the trees. Both have channels in every group. They are in memory, as
+// the runtime directory of a service is.
 #include "neighbours/ChannelCrowd.h"
 
 #include <array>
@@ -27,20 +28,37 @@ void makeChannels(const fs::path& tree, int countEach)
     }
 }
 
-void makeFolders(const fs::path& tree)
+fs::path folderOf(const fs::path& tree, int number)
 {
-    for (int folder = 0; folder < folderCount; ++folder)
-        fs::create_directory(tree / fmt::format("folder {:05}", folder));
+    return tree / fmt::format("folder {:05}", number);
+}
+
+fs::path placeInMemory()
+{
+    const fs::path memory = "/dev/shm";
+    return fs::exists(memory) ? memory : fs::temp_directory_path();
 }
 
 } // namespace
 
-ChannelCrowd::ChannelCrowd() : few_(directory_.path() / "few"), many_(directory_.path() / "many")
+ChannelCrowd::ChannelCrowd()
+    : directory_(placeInMemory()),
+      few_(directory_.path() / "few"),
+      many_(directory_.path() / "many")
 {
     makeChannels(few_, 1);
     makeChannels(many_, channelCount / static_cast<int>(groups.size()));
-    makeFolders(many_);
+    for (int folder = 0; folder < folderCount; ++folder)
+        fs::create_directory(folderOf(many_, folder));
     showFew();
+}
+
+// One by one: removing a folder with all that is in it takes minutes with so many folders.
+ChannelCrowd::~ChannelCrowd()
+{
+    std::error_code ignored;
+    for (int folder = 0; folder < folderCount; ++folder)
+        fs::remove(folderOf(many_, folder), ignored);
 }
 
 fs::path ChannelCrowd::root() const

@@ -12,6 +12,9 @@ namespace bench {
 class ChannelCrowd {
 public:
     ChannelCrowd();
+    ~ChannelCrowd();
+    ChannelCrowd(const ChannelCrowd&) = delete;
+    ChannelCrowd& operator=(const ChannelCrowd&) = delete;
 
     // Where the service finds the tree.
     [[nodiscard]] std::filesystem::path root() const;

@@ -14,7 +14,7 @@ namespace bench {
 namespace {
 
 constexpr std::chrono::microseconds period(5000);
-constexpr std::chrono::milliseconds patience(1500); // after the last call
+constexpr std::chrono::milliseconds patience(1000); // after the last call
 
 timespec timeUntil(Clock::time_point end)
 {

@@ -27,10 +27,12 @@ bool comesToRest(pid_t process)
 
 void FloodedServices::add(std::string_view flood, std::unique_ptr<ServiceProcess> service, double megabytesBefore)
 {
-    if (comesToRest(service->identifier()))
+    if (comesToRest(service->identifier())) {
         resting_.push_back({std::string(flood), std::move(service), megabytesBefore});
-    else
-        note(flood, residentMegabytes(service->identifier()) - megabytesBefore);
+        return;
+    }
+    note(fmt::format("{}, still at work", flood), residentMegabytes(service->identifier()) - megabytesBefore);
+    service->kill();
 }
 
 void FloodedServices::reportTo(Report& report)

@@ -10,14 +10,19 @@
 
 namespace bench {
 
+// The part of a number that one process of several has, rounded up.
+[[nodiscard]] constexpr int shareOf(int whole, int processes)
+{
+    return (whole + processes - 1) / processes;
+}
+
 // The part of a flood that one process does.
 struct FloodPart {
     const ServiceProcess& service;
     int processes; // that do the flood together
     std::function<void()> waitForStart; // says that this process is prepared
 
-    // This process's part of a number, rounded up.
-    [[nodiscard]] int of(int whole) const { return (whole + processes - 1) / processes; }
+    [[nodiscard]] int of(int whole) const { return shareOf(whole, processes); }
 };
 
 struct Flood {

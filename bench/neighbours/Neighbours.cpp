@@ -14,7 +14,6 @@
 #include "neighbours/PeerWaits.h"
 #include "neighbours/TraceStops.h"
 #include "peers/DaemonPeer.h"
-#include "platform/linux/trace/TracefsInstance.h"
 #include "support/ServiceProcess.h"
 #include "support/Waits.h"
 
@@ -33,8 +32,6 @@ struct Crowd {
     int processes;
     User user;
 
-    // The part of a number that each process has, rounded up.
-    [[nodiscard]] int shareOf(int whole) const { return (whole + processes - 1) / processes; }
     [[nodiscard]] std::string inWords() const
     {
         return fmt::format("{} process{}{}", processes, processes == 1 ? "" : "es",
@@ -66,7 +63,7 @@ public:
             add(what, waits, "beside burning processes", peers_.burners(crowd.processes), 2);
             if (DaemonPeer::isInstalled())
                 add(what, waits, "dbus-daemon, flooded",
-                    peers_.daemon(crowd.processes, crowd.shareOf(flood.connections)), 1);
+                    peers_.daemon(crowd.processes, shareOf(flood.connections, crowd.processes)), 1);
         } catch (const std::exception& problem) {
             report_.skip(what, problem.what());
         }
@@ -80,7 +77,7 @@ private:
     {
         if (crowd.user == User::Other && ::geteuid() != 0)
             return "only root can flood as another user";
-        if (flood.needs == Flood::Needs::Tracing && !platform::findTracefs("/proc/self/mounts"))
+        if (flood.needs == Flood::Needs::Tracing && !traceInstances())
             return "tracefs is not mounted";
         return {};
     }
@@ -139,6 +136,7 @@ private:
 
     const BenchOptions& options_;
     Report& report_;
+    const TracesLeft tracesLeft_; // outlives the services
     PeerWaits peers_;
     FloodedServices flooded_;
     std::unique_ptr<ChannelCrowd> channels_;

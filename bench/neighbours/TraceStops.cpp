@@ -1,6 +1,8 @@
 // If the service traces, it answers a start immediately, and again at the stop.
 #include "neighbours/TraceStops.h"
 
+#include "platform/linux/trace/TracefsInstance.h"
+
 #include <array>
 #include <fmt/format.h>
 #include <fstream>
@@ -37,7 +39,17 @@ std::string parameters()
                        KESTO_TRACE_DATA_CHILDREN_NODES, point);
 }
 
-std::filesystem::path parametersPath(const ServiceProcess& service)
+namespace fs = std::filesystem;
+
+std::set<fs::path> currentTraces()
+{
+    const auto place = traceInstances();
+    std::error_code ignored;
+    return place ? std::set<fs::path>(fs::begin(fs::directory_iterator(*place, ignored)), fs::directory_iterator())
+                 : std::set<fs::path>();
+}
+
+fs::path parametersPath(const ServiceProcess& service)
 {
     return service.socketPath().parent_path() / "parameters.plist";
 }
@@ -100,6 +112,22 @@ void emit(const kesto::Tracer& tracer, int count)
 }
 
 } // namespace
+
+std::optional<fs::path> traceInstances()
+{
+    const auto tracefs = platform::findTracefs("/proc/self/mounts");
+    return tracefs ? std::optional(*tracefs / "instances") : std::nullopt;
+}
+
+TracesLeft::TracesLeft() : others_(currentTraces()) { }
+
+TracesLeft::~TracesLeft()
+{
+    std::error_code ignored;
+    for (const fs::path& trace : currentTraces())
+        if (!others_.contains(trace))
+            fs::remove(trace, ignored);
+}
 
 void writeTraceParameters(const ServiceProcess& service)
 {

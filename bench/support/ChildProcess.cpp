@@ -103,6 +103,13 @@ void ChildProcess::end()
     ::kill(identifier_, SIGTERM);
     for (int wait = 0; wait < mostWaits && !hasEnded(); ++wait)
         std::this_thread::sleep_for(std::chrono::milliseconds(1));
+    kill();
+}
+
+void ChildProcess::kill()
+{
+    if (identifier_ == 0)
+        return;
     ::kill(identifier_, SIGKILL);
     ::waitpid(identifier_, nullptr, 0);
     identifier_ = 0;

@@ -30,6 +30,8 @@ public:
 
     [[nodiscard]] pid_t identifier() const { return identifier_; }
     [[nodiscard]] bool hasEnded() const;
+    // Ends it immediately, whatever it does; the destructor gives it time to end by itself.
+    void kill();
 
 private:
     explicit ChildProcess(pid_t identifier) : identifier_(identifier) { }

@@ -29,6 +29,8 @@ public:
 
     [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
     [[nodiscard]] std::filesystem::path socketPath() const;
+    // Ends the service immediately, whatever it does.
+    void kill() { process_.kill(); }
     // Lets programs of other users reach the socket.
     void admitOtherUsers() const;
     // Waits until the service listens.

@@ -15,9 +15,10 @@ namespace support {
 
 class TemporaryDirectory {
 public:
-    TemporaryDirectory()
+    TemporaryDirectory() : TemporaryDirectory(std::filesystem::temp_directory_path()) { }
+    explicit TemporaryDirectory(const std::filesystem::path& parent)
     {
-        std::string pattern = std::filesystem::temp_directory_path() / "kesto-test-XXXXXX";
+        std::string pattern = parent / "kesto-test-XXXXXX";
         if (::mkdtemp(pattern.data()) == nullptr)
             throw std::runtime_error("no temporary directory");
         path_ = pattern;
