@@ -54,7 +54,7 @@ private:
         [[nodiscard]] double secondsSince1970() const override { return 1'767'225'600; }
         [[nodiscard]] double systemUptime() const override { return 86'400; }
     };
-    class ImmediateQueue final : public platform::TurnQueue {
+    class ImmediateQueue final : public platform::Lane {
         void submit(platform::WorkItem item) override { item(); }
         void submit(platform::TurnItem item) override
         {
@@ -63,6 +63,12 @@ private:
             if (auto send = turn.letters.take())
                 send();
         }
+        [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t) override
+        {
+            return std::make_shared<ImmediateQueue>();
+        }
+        [[nodiscard]] bool isFull() override { return false; }
+        void setRoomHandler(std::function<void()>) override { }
         [[nodiscard]] bool isCurrent() const override { return true; }
     };
     class WorkQueues final : public platform::WorkQueues {

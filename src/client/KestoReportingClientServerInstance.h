@@ -43,6 +43,8 @@ public:
     [[nodiscard]] std::int32_t processIdentifier() const { return processIdentifier_; }
     // The number of its connection, which its events carry. Any thread.
     [[nodiscard]] std::uint64_t source() const { return source_; }
+    // The lane of the server queue for everything that this client causes. Any thread.
+    [[nodiscard]] const std::shared_ptr<platform::Lane>& queue() const { return queue_; }
     // Announces who is behind that number.
     void announceSource(platform::Turn& turn) const;
     // When the client was registered (seconds since 1970), and the name that it had then. Any thread.
@@ -89,13 +91,13 @@ private:
     // Runs `work(*this, turn)` on the server queue, with this object kept alive.
     template <typename Work> void submit(Work work)
     {
-        utility::serverQueue()->submit(
+        queue_->submit(
             [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
     }
     // The same for work that takes long with many messages, sessions or channels.
     template <typename Work> void submitLong(Work work)
     {
-        utility::serverQueue()->submitLong(
+        queue_->submitLong(
             [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
     }
     static void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
@@ -121,6 +123,7 @@ private:
     const std::int32_t processIdentifier_;
     const std::uint32_t userIdentifier_;
     const std::uint64_t source_ = platform::nextOriginNumber();
+    const std::shared_ptr<platform::Lane> queue_ = utility::serverQueue()->makeLane(userIdentifier_);
     std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);
     std::optional<std::string> clientProcessName_ KESTO_GUARDED_BY(registrationLock_);
     client::SessionMap clientReportingSessionMap_;

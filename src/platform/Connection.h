@@ -9,6 +9,7 @@
 
 #include "foundation/values/Value.h"
 #include "platform/Turn.h"
+#include "platform/WorkQueue.h"
 
 #include <cstdint>
 #include <expected>
@@ -69,6 +70,9 @@ public:
     virtual void setCallHandler(CallHandler handler) = 0;
     virtual void setInterruptionHandler(EndHandler handler) = 0;
     virtual void setInvalidationHandler(EndHandler handler) = 0;
+
+    // The lane on which the calls are carried out: while it is full, the connection stops reading. Before `resume`.
+    virtual void setLane(std::shared_ptr<Lane> lane) = 0;
 
     // Starts reading. Connection thread, in `shouldAcceptNewConnection`.
     virtual void resume() = 0;

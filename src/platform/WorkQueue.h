@@ -1,7 +1,7 @@
 // Work queues: named serial queues, the background concurrent queue, and work that starts later.
 //
-// Order: a serial queue runs one item at a time, in the order in which they were submitted. It releases an item, on the
-// queue, before it runs the next. The concurrent queue promises no order.
+// Order: a serial queue runs one item at a time, in the order in which they were submitted; only those of its lanes
+// take turns. It releases an item, on the queue, before it runs the next. The concurrent queue promises no order.
 //
 // Memory: an item sees everything that its submitter did before submitting it. An item of a serial queue also sees
 // everything that all earlier items did, on any thread. So data that only the items of one serial queue use needs no
@@ -46,7 +46,9 @@ public:
     [[nodiscard]] virtual bool isCurrent() const = 0;
 };
 
-// A serial queue that works in turns: it takes all that waits, runs it, and then hands what the items gathered to the
+class Lane;
+
+// A serial queue that works in turns: it runs what waits, but not for long, and then hands what the items gathered to the
 // platform, as a whole. Each item gets the turn that it runs in; items that gather nothing go without.
 class TurnQueue : public WorkQueue {
 public:
@@ -55,6 +57,20 @@ public:
     // The same for an item that may take longer than a millisecond: no helper runs it, because a helper has other
     // things to do, too.
     virtual void submitLong(TurnItem item) { submit(std::move(item)); }
+    // A lane of a user. The queue must outlive the items of its lanes.
+    [[nodiscard]] virtual std::shared_ptr<Lane> makeLane(std::uint32_t user) = 0;
+};
+
+// A part of a turn queue for one of many submitters, such as a client. Its items run on that queue, in their own order,
+// and take turns with those of the other lanes: first the users share the queue's time equally, then each user's lanes.
+// What is submitted to the queue itself is a lane, too, of a user of its own. Items of different lanes have no order.
+class Lane : public TurnQueue {
+public:
+    // Whether so many items wait that the submitter should pause. After it returned true, the handler is called once
+    // when few are left.
+    [[nodiscard]] virtual bool isFull() = 0;
+    // The thread that runs the items calls the handler. Set it before `isFull` is called.
+    virtual void setRoomHandler(std::function<void()> handler) = 0;
 };
 
 // How a serial queue is run.

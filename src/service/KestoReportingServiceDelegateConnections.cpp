@@ -16,23 +16,24 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
     const std::int32_t processIdentifier = connection->processIdentifier();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "newConnection: {}", connection->description());
 
-    std::weak_ptr<Client> weakClient;
+    std::shared_ptr<Client> client;
     {
         const foundation::Lock lock(lock_);
-        const auto client = std::make_shared<Client>(processIdentifier, weak_from_this(), connection->userIdentifier());
-        weakClient = client;
+        client = std::make_shared<Client>(processIdentifier, weak_from_this(), connection->userIdentifier());
         connection->setCallHandler(
             [adapter = client::ServiceProtocolAdapter(client, platform::current().ledger)](
                 platform::Connection::Call call) mutable { return adapter.handleCall(std::move(call)); });
     }
-    utility::serverQueue()->submit([self = shared_from_this(), weakClient](platform::Turn& turn) {
-        if (const auto client = weakClient.lock())
-            self->registerClient(turn, client);
+    const std::weak_ptr<Client> weakClient = client;
+    connection->setLane(client->queue());
+    client->queue()->submit([self = shared_from_this(), weakClient](platform::Turn& turn) {
+        if (const auto registered = weakClient.lock())
+            self->registerClient(turn, registered);
     });
     connection->setInterruptionHandler([weakClient] {
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "interruptionHandler: connection exited");
-        if (const auto client = weakClient.lock())
-            client->handleConnectionError();
+        if (const auto interrupted = weakClient.lock())
+            interrupted->handleConnectionError();
     });
     connection->setInvalidationHandler(
         [weakClient, processIdentifier] { handleInvalidation(processIdentifier, weakClient.lock()); });

@@ -2,10 +2,12 @@
 // client with the ID.
 #include "service/ReporterIndex.h"
 #include "support/ServiceHarness.h"
+#include "utility/ServerQueue.h"
 
-#include <array>
 #include <gtest/gtest.h>
+#include <memory>
 #include <rapidcheck/gtest.h>
+#include <vector>
 
 namespace {
 
@@ -50,9 +52,16 @@ RC_GTEST_PROP(ReporterIndex, FindsWhatAWalkOverTheRegistryFinds, ())
 
 class BareIndexTest : public testing::Test {
 protected:
+    BareIndexTest()
+    {
+        utility::createServerQueue();
+        for (const std::int32_t process : {1001, 1002})
+            clients_.push_back(std::make_unique<KestoReportingClientServerInstance>(process, nobody_));
+    }
+
     [[nodiscard]] const KestoReportingClientServerInstance& client(std::size_t number) const
     {
-        return clients_[number];
+        return *clients_[number];
     }
 
     service::ReporterIndex index;
@@ -60,7 +69,7 @@ protected:
 private:
     const TestPlatform platform_;
     const std::weak_ptr<KestoReportingServiceDelegateProtocol> nobody_;
-    const std::array<KestoReportingClientServerInstance, 2> clients_{{{1001, nobody_}, {1002, nobody_}}};
+    std::vector<std::unique_ptr<KestoReportingClientServerInstance>> clients_;
 };
 
 TEST_F(BareIndexTest, DoesNotCountClientsThatAreNotRegistered)

@@ -121,6 +121,56 @@ TEST_P(WorkQueuesContract, WhatAnItemSubmitsToItsQueueRunsBehindWhatWaitsThereAl
     EXPECT_THAT(waitForNotes(3), ElementsAre("a", "b", "c"));
 }
 
+TEST_P(WorkQueuesContract, TheItemsOfALaneRunOnItsQueueInTheirOrder)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    const auto lane = queue->makeLane(1000);
+    EXPECT_FALSE(lane->isCurrent());
+    lane->submit([&] { note(queue->isCurrent() && lane->isCurrent() ? "current" : "not current"); });
+    lane->submitLong([&](platform::Turn&) { note("long"); });
+    lane->submit([&](platform::Turn&) { note("with its turn"); });
+    EXPECT_THAT(waitForNotes(3), ElementsAre("current", "long", "with its turn"));
+}
+
+TEST_P(WorkQueuesContract, TheItemsOfAllLanesRunOneAtATime)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    std::vector<std::shared_ptr<platform::Lane>> lanes;
+    for (std::uint32_t user = 0; user < 4; ++user)
+        lanes.push_back(queue->makeLane(user / 2));
+    int ran = 0; // no lock: one item at a time uses it
+    for (int item = 0; item < 1000; ++item)
+        lanes[static_cast<std::size_t>(item) % lanes.size()]->submit([&] {
+            if (++ran == 1000)
+                note("done");
+        });
+    waitForNotes(1);
+    EXPECT_EQ(ran, 1000);
+}
+
+TEST_P(WorkQueuesContract, AnItemOfALaneMaySubmitToAnother)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    const auto one = queue->makeLane(1000);
+    const auto other = queue->makeLane(1001);
+    int seen = 0;
+    one->submit([&] {
+        seen = 1;
+        other->submit([&] { note(std::to_string(seen)); });
+    });
+    EXPECT_THAT(waitForNotes(1), ElementsAre("1"));
+}
+
+TEST_P(WorkQueuesContract, ALaneWithFewItemsIsNotFull)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    const auto lane = queue->makeLane(1000);
+    lane->setRoomHandler([] { ADD_FAILURE() << "it was never full"; });
+    lane->submit(noting("a"));
+    EXPECT_FALSE(lane->isFull());
+    waitForNotes(1);
+}
+
 TEST_P(WorkQueuesContract, AQueueIsCurrentWhileItRunsAnItemAndNowhereElse)
 {
     const auto queue = makeQueue();

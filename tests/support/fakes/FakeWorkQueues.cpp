@@ -16,7 +16,7 @@ namespace {
 constexpr std::ptrdiff_t mostBackgroundThreads = 4;
 }
 
-class FakeWorkQueues::Queue final : public platform::TurnQueue, public std::enable_shared_from_this<Queue> {
+class FakeWorkQueues::Queue final : public platform::Lane, public std::enable_shared_from_this<Queue> {
 public:
     Queue(FakeWorkQueues& queues, std::ptrdiff_t mostAtOnce) : queues_(queues), mostAtOnce_(mostAtOnce) { }
 
@@ -25,6 +25,10 @@ public:
         submit([item = std::move(item)](platform::Turn&) mutable { item(); });
     }
     void submit(platform::TurnItem item) override { queues_.items_.push_back({shared_from_this(), std::move(item)}); }
+    // The order of submission is fair, because all items take equally long here; and a lane is never full.
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t) override { return shared_from_this(); }
+    [[nodiscard]] bool isFull() override { return false; }
+    void setRoomHandler(std::function<void()>) override { }
 
     [[nodiscard]] bool isCurrent() const override
     {

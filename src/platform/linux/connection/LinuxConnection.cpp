@@ -74,6 +74,18 @@ std::string LinuxConnection::description() const
     return fmt::format("connection of process {} (user {})", peer_.processIdentifier, peer_.userIdentifier);
 }
 
+void LinuxConnection::setLane(std::shared_ptr<Lane> lane)
+{
+    lane_ = std::move(lane);
+    lane_->setRoomHandler([weak = weak_from_this()] {
+        if (const auto self = weak.lock()) {
+            self->isLaneFull_ = false;
+            const foundation::Lock lock(self->lock_);
+            self->watch();
+        }
+    });
+}
+
 void LinuxConnection::resume()
 {
     assert(hub_->isConnectionThread());
@@ -208,6 +220,11 @@ std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
             break;
     }
     hub_->calls.clear();
+    if (lane_ != nullptr) {
+        isLaneFull_ = true; // before the question, because the lane may have room again at once
+        if (!lane_->isFull())
+            isLaneFull_ = false;
+    }
     if (!result)
         hub_->ledger.count(Counter::FramesNotACall);
     return result;
@@ -376,15 +393,16 @@ void LinuxConnection::watch()
 {
     if (!isResumed_ || isOver_)
         return;
+    const bool behind = isBehind();
     epoll_event event = {};
     event.events = EPOLLRDHUP;
-    if (!isBehind())
+    if (!behind && !isLaneFull_)
         event.events |= EPOLLIN;
     if (!output_.empty() || !statusRequests_.empty())
         event.events |= EPOLLOUT;
     if (event.events == watchedEvents_)
         return;
-    if ((watchedEvents_ & ~event.events & EPOLLIN) != 0) {
+    if (behind && (watchedEvents_ & EPOLLIN) != 0) {
         ++readingPauses_;
         hub_->ledger.count(Counter::ReadingPauses);
     }

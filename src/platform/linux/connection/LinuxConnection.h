@@ -7,6 +7,9 @@
 // A client may ask for the status as often as it likes: a connection makes one answer in each pass of the connection
 // thread, and only when the socket has taken the one before. The other requests wait; they count as unanswered calls.
 //
+// A connection reads only while its lane has room, so that calls that cannot be carried out soon stay with their
+// client.
+//
 // Every client is treated as hostile. If one breaks the protocol, its own connection ends, with one line in the log. If
 // it asks faster than it gets answers, or does not read its answers, the connection stops reading from it until it is
 // less behind; if even then far too many answers are unread, the connection ends. At the end the log says what this
@@ -58,6 +61,7 @@ public:
     void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
+    void setLane(std::shared_ptr<Lane> lane) override;
     void resume() override;
     void send(Turn& turn, std::string frame) override;
     void write(std::string frames) override;
@@ -105,6 +109,7 @@ private:
     const Peer peer_;
 
     // Only for the connection thread.
+    std::shared_ptr<Lane> lane_; // null: it is never full
     CallHandler callHandler_;
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;
@@ -115,6 +120,7 @@ private:
     bool awaitsStatus_ = false; // a request waits, so that other connections need no lock to find none
 
     // How far the client is behind.
+    std::atomic<bool> isLaneFull_ = false; // this alone is not the client's fault, so no pause is counted
     std::atomic<std::uint64_t> unanswered_; // calls in the upper half, their bytes in the lower half
     std::atomic<std::size_t> unsentBytes_; // from `send` until the socket accepts them
     std::atomic<std::uint64_t> droppedBytes_; // of answers that the client will not get

@@ -37,12 +37,12 @@ private:
 
 std::shared_ptr<WorkQueue> LinuxWorkQueues::makeSerialQueue(std::string_view name, SerialQueueOptions options)
 {
-    return std::make_shared<SerialQueue>(name, options, SerialQueue::TurnEnd(), longestHelp_);
+    return std::make_shared<SerialQueue>(name, options, SerialQueue::TurnEnd(), longestTurn_);
 }
 
 std::shared_ptr<TurnQueue> LinuxWorkQueues::makeTurnQueue(std::string_view name, SerialQueueOptions options)
 {
-    auto queue = std::make_shared<SerialQueue>(name, options, turnEnd_, longestHelp_);
+    auto queue = std::make_shared<SerialQueue>(name, options, turnEnd_, longestTurn_);
     const foundation::Lock lock(lock_);
     std::erase_if(turnQueues_, [](const auto& known) { return known.expired(); });
     turnQueues_.push_back(queue);

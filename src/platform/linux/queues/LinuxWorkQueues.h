@@ -20,9 +20,9 @@ namespace platform {
 // Any thread. A serial queue lives as long as its owner keeps it, even longer than this.
 class LinuxWorkQueues final : public WorkQueues {
 public:
-    // A helper of its queues begins no further item after so long.
-    explicit LinuxWorkQueues(std::chrono::nanoseconds longestHelp = SerialQueue::longestHelp)
-        : longestHelp_(longestHelp)
+    // A turn of its queues begins no further items after so long.
+    explicit LinuxWorkQueues(std::chrono::nanoseconds longestTurn = SerialQueue::longestTurn)
+        : longestTurn_(longestTurn)
     {
     }
 
@@ -52,7 +52,7 @@ public:
 private:
     [[nodiscard]] std::vector<std::shared_ptr<SerialQueue>> livingTurnQueues() const;
 
-    const std::chrono::nanoseconds longestHelp_;
+    const std::chrono::nanoseconds longestTurn_;
     SerialQueue::TurnEnd turnEnd_;
     mutable foundation::Mutex lock_;
     std::vector<std::weak_ptr<SerialQueue>> turnQueues_ KESTO_GUARDED_BY(lock_);

@@ -1,10 +1,12 @@
 // The queue's thread and helpers alike take a turn, run it, and give it back; a helper may leave the rest of it to the
-// queue's thread. Four flags under one lock coordinate them.
+// queue's thread. Four flags under one lock coordinate them. The thread that has the turn takes the items a few at a
+// time, so that the lock costs little and the order stays fair while others submit.
 #include "platform/linux/queues/SerialQueue.h"
 
 #include "foundation/Mutex.h"
 #include "platform/Turn.h"
 #include "platform/linux/process/Thread.h"
+#include "platform/linux/queues/FairOrder.h"
 #include "platform/linux/queues/ThreadHeap.h"
 
 #include <cassert>
@@ -13,24 +15,47 @@
 
 namespace platform {
 
+namespace {
+constexpr std::uint32_t theService = ~0U; // no user has this number
+constexpr int partIfContested = 4; // of the longest turn
+} // namespace
+
 class SerialQueue::Work : public std::enable_shared_from_this<Work> {
 public:
-    Work(TurnEnd turnEnd, bool mayBeHelped, std::chrono::nanoseconds helpFor)
+    Work(TurnEnd turnEnd, bool mayBeHelped, std::chrono::nanoseconds turnFor)
         : turnEnd_(std::move(turnEnd)),
           mayBeHelped_(mayBeHelped),
-          longestHelp_(helpFor)
+          longestTurn_(turnFor)
     {
     }
 
-    void add(TurnItem item, bool mayTakeLong = false)
+    [[nodiscard]] std::shared_ptr<FairOrder::Lane> makeLane(std::uint32_t user)
+    {
+        const foundation::Lock lock(lock_);
+        return order_.makeLane(user);
+    }
+
+    [[nodiscard]] bool isFull(FairOrder::Lane& lane)
+    {
+        const foundation::Lock lock(lock_);
+        return FairOrder::isFull(lane);
+    }
+
+    void setRoomHandler(FairOrder::Lane& lane, std::function<void()> handler)
+    {
+        const foundation::Lock lock(lock_);
+        FairOrder::setRoomHandler(lane, std::make_shared<const FairOrder::RoomHandler>(std::move(handler)));
+    }
+
+    void add(const std::shared_ptr<FairOrder::Lane>& lane, TurnItem item, bool mayTakeLong = false)
     {
         assert(!mayBeHelped_ || !thisThread.isHelper || !foundation::Lock::isAnyHeld());
         const bool mayHelp = mayBeHelped_ && thisThread.mayHelp(this);
         if (mayHelp && thisThread.toHelp == nullptr)
             thisThread.toHelp = shared_from_this();
         const foundation::Lock lock(lock_);
-        waiting_.push_back({std::move(item), mayTakeLong});
-        const bool isLeftToHelper = mayHelp && waiting_.size() <= mostItemsHelpedWith && !mayTakeLong;
+        order_.add(lane, {std::move(item), mayTakeLong});
+        const bool isLeftToHelper = mayHelp && order_.waiting() <= mostItemsHelpedWith && !mayTakeLong;
         if (!isTurnTaken_ && !isLeftToHelper)
             wakeThread(); // under the lock: after it, the item may destroy the queue
     }
@@ -50,9 +75,9 @@ public:
             const foundation::Lock lock(lock_);
             wakeThread();
         });
-        for (Next next = waitForNext(heap); next != Next::End; next = waitForNext(heap)) {
-            if (next == Next::Turn)
-                runTurn();
+        for (Duty duty = waitForDuty(heap); duty != Duty::End; duty = waitForDuty(heap)) {
+            if (duty == Duty::Turn)
+                runTurn(Runner::OwnThread);
             heap.tidyIfAsked();
         }
     }
@@ -62,11 +87,11 @@ public:
     {
         {
             const foundation::Lock lock(lock_);
-            if (isTurnTaken_ || waiting_.empty() || waiting_.size() > mostItemsHelpedWith)
+            if (isTurnTaken_ || order_.waiting() == 0 || order_.waiting() > mostItemsHelpedWith)
                 return;
             takeTurn();
         }
-        runTurnAsHelper();
+        runTurn(Runner::Helper);
     }
 
     [[nodiscard]] bool isCurrent() const noexcept { return thisThread.runs == this; }
@@ -74,14 +99,14 @@ public:
     void finish()
     {
         const foundation::Lock lock(lock_);
-        while (isTurnTaken_ || !waiting_.empty())
+        while (isTurnTaken_ || order_.waiting() != 0)
             finished_.wait(lock_);
     }
 
     [[nodiscard]] std::size_t unfinishedItems()
     {
         const foundation::Lock lock(lock_);
-        return waiting_.size() + itemsOfTurn_;
+        return order_.waiting() + takenInTurn_;
     }
 
     // The calling thread's part in serial queues.
@@ -100,31 +125,28 @@ public:
 private:
     using Clock = std::chrono::steady_clock;
 
-    static constexpr std::size_t mostRoomKept = 1024; // in items; further room of a burst is freed
-
-    struct Item {
-        TurnItem run;
-        bool mayTakeLong = false;
-    };
+    enum class Runner : std::uint8_t { OwnThread, Helper };
 
     // What the queue's thread does next.
-    enum class Next : std::uint8_t { Turn, Heap, End };
+    enum class Duty : std::uint8_t { Turn, Heap, End };
+    // What the thread with the turn does next.
+    enum class Next : std::uint8_t { Run, Leave, End };
 
-    Next waitForNext(const ThreadHeap& heap)
+    Duty waitForDuty(const ThreadHeap& heap)
     {
         const foundation::Lock lock(lock_);
-        while (waiting_.empty() || isTurnTaken_) {
+        while (order_.waiting() == 0 || isTurnTaken_) {
             if (std::exchange(isTurnLeft_, false))
-                return Next::Turn;
+                return Duty::Turn;
             if (isEnding_ && !isTurnTaken_)
-                return Next::End;
+                return Duty::End;
             if (heap.isAsked())
-                return Next::Heap;
+                return Duty::Heap;
             isAsleep_ = true;
             changed_.wait(lock_);
         }
         takeTurn();
-        return Next::Turn;
+        return Duty::Turn;
     }
 
     void wakeThread() KESTO_REQUIRES(lock_)
@@ -136,54 +158,53 @@ private:
     void takeTurn() KESTO_REQUIRES(lock_)
     {
         isTurnTaken_ = true;
-        items_.swap(waiting_);
-        itemsOfTurn_ = items_.size();
+        leftInTurn_ = order_.waiting();
+        turnTime_ = {};
     }
 
-    // Runs what is left of the turn.
-    void runTurn()
+    // Runs the turn, or what is left of it, to its end, unless a helper has to leave it.
+    void runTurn(Runner runner)
     {
         thisThread.runs = this;
-        while (ran_ < items_.size())
-            runNext();
-        endTurn();
-    }
-
-    // Whether to read the clock, which costs some hundredths of what an item does: not before the first item, which
-    // begins at once, and not before each of the others.
-    [[nodiscard]] static bool isTimeToLook(std::size_t ran) noexcept
-    {
-        constexpr std::size_t itemsBetween = 8;
-        return ran % itemsBetween == 1;
-    }
-
-    void runTurnAsHelper()
-    {
-        thisThread.runs = this;
-        const auto end = items_.size() > 1 ? Clock::now() + longestHelp_ : Clock::time_point::max();
-        while (ran_ < items_.size()) {
-            if (items_[ran_].mayTakeLong || (isTimeToLook(ran_) && Clock::now() >= end))
+        auto begin = Clock::now();
+        for (Next next = takeItems(runner); next != Next::End; next = takeItems(runner)) {
+            if (next == Next::Leave)
                 return leaveTurn();
-            runNext();
+            if (const auto tellOfRoom = std::exchange(roomHandler_, nullptr))
+                (*tellOfRoom)();
+            for (FairOrder::Item& item : items_) {
+                item.run(turn_);
+                item.run = nullptr; // what it holds is released before the next one runs
+            }
+            const auto now = Clock::now();
+            itemsTime_ = now - std::exchange(begin, now);
         }
-        if (turnEnd_.wouldWait && turnEnd_.wouldWait())
+        if (runner == Runner::Helper && turnEnd_.wouldWait && turnEnd_.wouldWait())
             return leaveTurn();
         endTurn();
     }
 
-    void runNext()
+    // Takes the items that run next.
+    Next takeItems(Runner runner)
     {
-        TurnItem& item = items_[ran_++].run;
-        item(turn_);
-        item = nullptr; // what it holds is released before the next one runs
+        const foundation::Lock lock(lock_);
+        if (!items_.empty()) {
+            order_.charge(itemsTime_);
+            turnTime_ += itemsTime_;
+            items_.clear();
+        }
+        if (leftInTurn_ == 0 || turnTime_ > (order_.isContested() ? longestTurn_ / partIfContested : longestTurn_))
+            return Next::End;
+        if (runner == Runner::Helper && order_.front().mayTakeLong)
+            return Next::Leave;
+        roomHandler_ = order_.take(items_, leftInTurn_);
+        leftInTurn_ -= items_.size();
+        takenInTurn_ += items_.size();
+        return Next::Run;
     }
 
     void endTurn()
     {
-        items_.clear();
-        ran_ = 0;
-        if (items_.capacity() > mostRoomKept)
-            items_ = std::vector<Item>();
         if (turnEnd_.handler)
             turnEnd_.handler(turn_);
         thisThread.runs = nullptr;
@@ -202,24 +223,29 @@ private:
     {
         const foundation::Lock lock(lock_);
         isTurnTaken_ = false;
-        itemsOfTurn_ = 0;
-        if (isEnding_ || !waiting_.empty())
+        takenInTurn_ = 0;
+        if (isEnding_ || order_.waiting() != 0)
             wakeThread();
-        if (waiting_.empty())
+        if (order_.waiting() == 0)
             finished_.notifyAll();
     }
 
     const TurnEnd turnEnd_;
     const bool mayBeHelped_;
-    const std::chrono::nanoseconds longestHelp_;
+    const std::chrono::nanoseconds longestTurn_;
     foundation::Mutex lock_;
     foundation::Condition changed_;
     foundation::Condition finished_; // nothing waits or runs
-    std::vector<Item> waiting_ KESTO_GUARDED_BY(lock_);
-    std::vector<Item> items_; // this, `ran_` and `turn_` belong to the thread that has taken the turn
-    std::size_t ran_ = 0; // of the items
+    FairOrder order_ KESTO_GUARDED_BY(lock_);
+    // These belong to the thread that has taken the turn.
     Turn turn_;
-    std::size_t itemsOfTurn_ KESTO_GUARDED_BY(lock_) = 0;
+    std::vector<FairOrder::Item> items_; // that run now
+    std::shared_ptr<const FairOrder::RoomHandler> roomHandler_; // of their lane, if it has room again
+    std::chrono::nanoseconds itemsTime_{};
+    std::chrono::nanoseconds turnTime_{};
+    std::size_t leftInTurn_ = 0; // items that waited when it began, and may run in it
+
+    std::size_t takenInTurn_ KESTO_GUARDED_BY(lock_) = 0;
     bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // a thread is running one
     bool isTurnLeft_ KESTO_GUARDED_BY(lock_) = false; // by a helper, for the queue's thread
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread sleeps, and has not been woken yet
@@ -228,9 +254,38 @@ private:
 
 thread_local SerialQueue::Work::ThisThread SerialQueue::Work::thisThread;
 
+// Items that run on the queue in turns with those of its other lanes.
+class SerialQueue::QueueLane final : public Lane {
+public:
+    QueueLane(std::shared_ptr<Work> work, std::uint32_t user) : work_(std::move(work)), lane_(work_->makeLane(user)) { }
+
+    void submit(WorkItem item) override
+    {
+        work_->add(lane_, [item = std::move(item)](Turn&) mutable { item(); });
+    }
+    void submit(TurnItem item) override { work_->add(lane_, std::move(item)); }
+    void submitLong(TurnItem item) override
+    {
+        constexpr bool mayTakeLong = true;
+        work_->add(lane_, std::move(item), mayTakeLong);
+    }
+    [[nodiscard]] bool isCurrent() const override { return work_->isCurrent(); }
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user) override
+    {
+        return std::make_shared<QueueLane>(work_, user);
+    }
+    [[nodiscard]] bool isFull() override { return work_->isFull(*lane_); }
+    void setRoomHandler(std::function<void()> handler) override { work_->setRoomHandler(*lane_, std::move(handler)); }
+
+private:
+    const std::shared_ptr<Work> work_;
+    const std::shared_ptr<FairOrder::Lane> lane_;
+};
+
 SerialQueue::SerialQueue(std::string_view name, SerialQueueOptions options, TurnEnd turnEnd,
-                         std::chrono::nanoseconds helpFor)
-    : work_(std::make_shared<Work>(std::move(turnEnd), options.mayBeHelped, helpFor)),
+                         std::chrono::nanoseconds turnFor)
+    : work_(std::make_shared<Work>(std::move(turnEnd), options.mayBeHelped, turnFor)),
+      lane_(std::make_unique<QueueLane>(work_, theService)),
       thread_(startThread(name, options.quality, [work = work_] { work->run(); }))
 {
 }
@@ -246,18 +301,22 @@ SerialQueue::~SerialQueue()
 
 void SerialQueue::submit(WorkItem item)
 {
-    work_->add([item = std::move(item)](Turn&) mutable { item(); });
+    lane_->submit(std::move(item));
 }
 
 void SerialQueue::submit(TurnItem item)
 {
-    work_->add(std::move(item));
+    lane_->submit(std::move(item));
 }
 
 void SerialQueue::submitLong(TurnItem item)
 {
-    constexpr bool mayTakeLong = true;
-    work_->add(std::move(item), mayTakeLong);
+    lane_->submitLong(std::move(item));
+}
+
+std::shared_ptr<Lane> SerialQueue::makeLane(std::uint32_t user)
+{
+    return lane_->makeLane(user);
 }
 
 bool SerialQueue::isCurrent() const

@@ -12,13 +12,17 @@
 // that both threads work side by side. Only one turn runs at a time.
 //
 // The helper has other things to do, which must not wait for the queue. So it leaves the rest of a turn to the queue's
-// thread when it has helped for long enough, when the next item may take long, or when the end of the turn would wait.
+// thread when the next item may take long, or when the end of the turn would wait.
+//
+// A turn also ends after some time, because what it sends leaves at its end. What it leaves waiting belongs to the next
+// turn.
 #pragma once
 
 #include "platform/WorkQueue.h"
 
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <string_view>
@@ -31,9 +35,10 @@ class SerialQueue final : public TurnQueue {
 public:
     using TurnEndHandler = std::function<void(Turn& turn)>;
 
-    // A helper runs only turns of at most so many items, and usually begins no further item after so long.
+    // A helper runs turns only while at most so many items wait.
     static constexpr std::size_t mostItemsHelpedWith = 1024;
-    static constexpr std::chrono::microseconds longestHelp{250};
+    // After so long, a turn begins no further items; and after a quarter of it while several lanes have some.
+    static constexpr std::chrono::microseconds longestTurn{200};
 
     // What happens at the end of every turn, when the items and everything that they held are destroyed. Both may be
     // empty.
@@ -42,7 +47,7 @@ public:
         std::function<bool()> wouldWait; // whether the handler would now make its thread wait for another
     };
     SerialQueue(std::string_view name, SerialQueueOptions options, TurnEnd turnEnd = {},
-                std::chrono::nanoseconds helpFor = longestHelp);
+                std::chrono::nanoseconds turnFor = longestTurn);
     // Waits until all submitted items have run. If one of the queue's own items destroys the queue, this does not wait,
     // and the thread ends later.
     ~SerialQueue() override;
@@ -52,6 +57,7 @@ public:
     void submit(WorkItem item) override;
     void submit(TurnItem item) override;
     void submitLong(TurnItem item) override;
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user) override;
     [[nodiscard]] bool isCurrent() const override;
 
     // Returns when no item waits and no turn runs. Not for the queue's items and helpers.
@@ -76,8 +82,10 @@ public:
 
 private:
     class Work;
+    class QueueLane;
 
-    std::shared_ptr<Work> work_; // shared with the thread, which may outlive the queue
+    std::shared_ptr<Work> work_; // shared with the thread and the lanes, which may outlive the queue
+    std::unique_ptr<TurnQueue> lane_; // of what is submitted to the queue itself
     std::thread thread_;
 };
 

@@ -40,6 +40,8 @@ public:
             [this, record](platform::Connection::Call call) { return take(*record, std::move(call)); });
         connection->setInterruptionHandler([this, record] { note(*record, "interrupted"); });
         connection->setInvalidationHandler([this, record] { note(*record, "invalidated"); });
+        if (beforeResuming)
+            beforeResuming(*connection);
         progress.change([&] { records.push_back(record); });
         connection->resume();
         return true;
@@ -136,6 +138,7 @@ protected:
     Progress progress;
     std::vector<std::shared_ptr<ConnectionRecord>> records;
     Handler handler; // instead of keeping the call
+    std::function<void(platform::Connection&)> beforeResuming; // on the connection thread
     std::function<void()> beforeListening; // sets up the listener
     ledger::Ledger ledger;
     std::unique_ptr<platform::LinuxConnectionListener> listener;

@@ -206,6 +206,44 @@ TEST_F(ConnectionLimits, WhoDoesNotListenIsReadFromAgainWhenItsAnswersWereDroppe
     EXPECT_TRUE(waitForHistory(record, {"call 1"}));
 }
 
+// Nothing of this is the client's fault: it reads its answers, and has few calls unanswered.
+TEST_F(ConnectionLimits, ReadingStopsWhileTheLaneIsFullAndNoPauseIsCounted)
+{
+    constexpr std::uint64_t calls = 20'000;
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeTurnQueue("server", {});
+    const auto mayRun = queues.makeSemaphore(0);
+    queue->submit([&] { mayRun->wait(); });
+    const auto lane = queue->makeLane(0);
+    beforeResuming = [&, isFirst = true](Connection& connection) mutable {
+        if (std::exchange(isFirst, false))
+            connection.setLane(lane);
+    };
+    std::atomic<std::uint64_t> submitted = 0;
+    std::atomic<std::uint64_t> ran = 0;
+    handler = [&](ConnectionRecord&, Connection::Call&) -> std::expected<void, Connection::Violation> {
+        ++submitted;
+        lane->submit([&] { ++ran; });
+        return {};
+    };
+    listen();
+    SocketClient client(path);
+    const std::jthread writer([&] {
+        for (std::uint64_t number = 0; number < calls; ++number)
+            client.write(callNumber(static_cast<int>(number)));
+    });
+    ASSERT_TRUE(waitForCounter(submitted, 512));
+    SocketClient other(path); // when it has been read from, the first one was not again
+    static_cast<void>(connected());
+    static_cast<void>(connected());
+    const std::size_t mostInOneRead = ConnectionHub::mostReadAtOnce / callNumber(1).size();
+    EXPECT_LE(submitted, 512 + mostInOneRead + 1);
+    mayRun->signal();
+    EXPECT_TRUE(waitForCounter(ran, calls));
+    EXPECT_EQ(counted(Counter::ReadingPauses), 0U);
+    stop();
+}
+
 // Also the starts of ten thousand sessions, which are answered when the sessions stop.
 TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
 {

@@ -45,7 +45,7 @@ protected:
         done->wait();
     }
 
-    LinuxWorkQueues queues{24h}; // helpers run whole turns, however slow the machine is
+    LinuxWorkQueues queues{24h}; // turns do not end before their items, however slow the machine is
 };
 
 std::string nameOfThisThread()
@@ -254,9 +254,9 @@ TEST_F(TurnsTest, AHelperRunsATurnItselfWithItsEnd)
 // What a helper leaves to the queue's thread.
 class LeftTurnsTest : public testing::Test {
 protected:
-    std::shared_ptr<TurnQueue> makeQueue(std::chrono::nanoseconds longestHelp, bool wouldWait)
+    std::shared_ptr<TurnQueue> makeQueue(std::chrono::nanoseconds longestTurn, bool wouldWait)
     {
-        queues.emplace(longestHelp);
+        queues.emplace(longestTurn);
         queues->setTurnEndHandler([this](Turn&) { note("end"); }, [wouldWait] { return wouldWait; });
         return queues->makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
     }
@@ -270,19 +270,25 @@ protected:
     std::optional<LinuxWorkQueues> queues;
 };
 
-TEST_F(LeftTurnsTest, AHelperLeavesTheRestWhenItHasHelpedForLongEnough)
+TEST_F(LeftTurnsTest, ATurnThatHasTakenLongEnoughEndsAndTheRestIsTheNextOne)
 {
     auto queue = makeQueue(0ns, false);
+    const auto slow = [this](const char* name) { // so that it is taken alone
+        return [this, name] {
+            std::this_thread::sleep_for(1ms);
+            note(name);
+        };
+    };
     SerialQueue::Helper helper;
-    queue->submit([&] { note("first"); });
-    queue->submit([&] { note("second"); });
-    queue->submit([&] { note("third"); });
+    queue->submit(slow("first"));
+    queue->submit(slow("second"));
+    queue->submit(slow("third"));
     helper.help();
     queue.reset();
-    EXPECT_EQ(history, (std::vector<std::string>{"first helped", "second", "third", "end"}));
+    EXPECT_EQ(history, (std::vector<std::string>{"first helped", "end helped", "second", "end", "third", "end"}));
 }
 
-TEST_F(LeftTurnsTest, AHelperRunsASingleItemHoweverShortItMayHelp)
+TEST_F(LeftTurnsTest, AHelperRunsASingleItemHoweverShortATurnMayBe)
 {
     auto queue = makeQueue(0ns, false);
     SerialQueue::Helper helper;
@@ -352,6 +358,121 @@ TEST_F(LeftTurnsTest, WhatIsSubmittedWhileATurnIsLeftComesBehindIt)
     queue.reset();
     EXPECT_EQ(ran.size(), 3000U);
     EXPECT_TRUE(std::ranges::is_sorted(ran));
+}
+
+// A queue with lanes. The names of the items that ran, in order.
+class LanesTest : public WorkQueuesTest {
+protected:
+    // Holds the queue up until `go`, so that all that is submitted meanwhile waits.
+    void hold()
+    {
+        holder->submit([this] {
+            begun->signal();
+            mayGo->wait();
+        });
+        begun->wait();
+    }
+    void go() { mayGo->signal(); }
+    void submit(Lane& lane, const std::string& name, std::chrono::milliseconds time = 0ms)
+    {
+        lane.submit([this, name, time] {
+            for (const auto end = std::chrono::steady_clock::now() + time; std::chrono::steady_clock::now() < end;) { }
+            ran.push_back(name);
+        });
+    }
+
+    const std::unique_ptr<Semaphore> begun = queues.makeSemaphore(0);
+    const std::unique_ptr<Semaphore> mayGo = queues.makeSemaphore(0);
+    std::vector<std::string> ran;
+    std::shared_ptr<TurnQueue> queue = queues.makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
+    const std::shared_ptr<Lane> holder = queue->makeLane(0);
+};
+
+TEST_F(LanesTest, AnItemDoesNotWaitForTheManyOfAnotherLane)
+{
+    const auto flood = queue->makeLane(1000);
+    const auto other = queue->makeLane(1000);
+    hold();
+    for (int item = 0; item < 100; ++item)
+        submit(*flood, "flood", 1ms);
+    submit(*other, "other", 1ms);
+    go();
+    queue.reset();
+    ASSERT_EQ(ran.size(), 101U);
+    EXPECT_LE(std::ranges::find(ran, "other") - ran.begin(), 2);
+}
+
+TEST_F(LanesTest, AUserDoesNotWaitForTheManyLanesOfAnother)
+{
+    std::vector<std::shared_ptr<Lane>> flood;
+    const auto other = queue->makeLane(1001);
+    hold();
+    for (int lane = 0; lane < 20; ++lane) {
+        flood.push_back(queue->makeLane(1000));
+        for (int item = 0; item < 5; ++item)
+            submit(*flood.back(), "flood", 1ms);
+    }
+    for (int item = 0; item < 5; ++item)
+        submit(*other, "other", 1ms);
+    go();
+    queue.reset();
+    EXPECT_EQ(std::ranges::count(ran.begin(), ran.begin() + 20, "other"), 5) << "10 would be enough on a quiet machine";
+}
+
+TEST_F(LanesTest, TheQueueItselfIsALaneOfItsOwnUser)
+{
+    const auto flood = queue->makeLane(1000);
+    hold();
+    for (int item = 0; item < 100; ++item)
+        submit(*flood, "flood", 1ms);
+    queue->submit([this] { ran.emplace_back("queue"); });
+    go();
+    queue.reset();
+    EXPECT_LE(std::ranges::find(ran, "queue") - ran.begin(), 1);
+}
+
+TEST_F(LanesTest, AnItemOfALaneIsCurrentOnItsQueue)
+{
+    const auto lane = queue->makeLane(1000);
+    bool isCurrent = false;
+    lane->submit([&] { isCurrent = queue->isCurrent() && lane->isCurrent(); });
+    drain(*lane);
+    EXPECT_TRUE(isCurrent);
+}
+
+TEST_F(LanesTest, AFullLaneSaysOnceWhenItHasRoomAgain)
+{
+    const auto lane = queue->makeLane(1000);
+    std::atomic<int> calls = 0;
+    lane->setRoomHandler([&] { ++calls; });
+    hold();
+    for (int item = 0; item < 511; ++item)
+        submit(*lane, "a");
+    EXPECT_FALSE(lane->isFull());
+    submit(*lane, "a");
+    EXPECT_TRUE(lane->isFull());
+    EXPECT_EQ(calls, 0);
+    go();
+    queue.reset();
+    EXPECT_EQ(calls, 1);
+    EXPECT_EQ(ran.size(), 512U);
+}
+
+TEST_F(LanesTest, AHelperServesLanesInTheSameOrder)
+{
+    const auto flood = queue->makeLane(1000);
+    const auto other = queue->makeLane(1001);
+    hold();
+    for (int item = 0; item < 10; ++item)
+        submit(*flood, "flood", 1ms);
+    submit(*other, "other");
+    {
+        const SerialQueue::Helper helper;
+        go();
+        submit(*flood, "flood", 1ms);
+    }
+    queue.reset();
+    EXPECT_LE(std::ranges::find(ran, "other") - ran.begin(), 1);
 }
 
 TEST_F(TurnsTest, AHelpedTurnIsTheQueues)
