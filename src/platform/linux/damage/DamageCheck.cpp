@@ -13,6 +13,7 @@
 #include <string>
 #include <sys/resource.h>
 #include <sys/syscall.h>
+#include <system_error>
 #include <unistd.h>
 #include <utility>
 
@@ -68,16 +69,42 @@ DamageCheck::~DamageCheck()
     breakOff();
 }
 
+void DamageCheck::ask()
+{
+    isAsked_ = true;
+    notBefore_ = 0;
+    std::error_code error;
+    std::filesystem::remove(stampPath_, error);
+}
+
 // A stamp from the future was made by a clock that was wrong, and counts for nothing.
-void DamageCheck::beginIfDue()
+void DamageCheck::beginIfDue(const std::function<bool()>& isInPlace)
 {
     const bool isDue = isAsked_ || std::abs(clock_.secondsSince1970() - checkedAt_) >= secondsBetweenChecks;
     if (!isDue || clock_.systemUptime() < notBefore_ || thread_.joinable())
         return;
+    Connection connection = connect();
+    if (!isInPlace())
+        return;
     isAsked_ = false;
     hasEnded_ = false;
     mustEnd_ = false;
-    thread_ = startThread("damage-check", QualityOfService::Background, [this] { run(); });
+    thread_ = startThread("damage-check", QualityOfService::Background,
+                          [this, opened = std::move(connection)]() mutable { run(std::move(opened)); });
+}
+
+void DamageCheck::Close::operator()(sqlite3* connection) const noexcept
+{
+    ::sqlite3_close(connection);
+}
+
+// Null if the file cannot be opened. Nothing is read yet.
+DamageCheck::Connection DamageCheck::connect() const
+{
+    sqlite3* opened = nullptr;
+    const int isOpen = ::sqlite3_open_v2(path_.c_str(), &opened, SQLITE_OPEN_READONLY, nullptr);
+    Connection connection(opened);
+    return isOpen == SQLITE_OK ? std::move(connection) : Connection();
 }
 
 void DamageCheck::breakOff()
@@ -123,40 +150,35 @@ void DamageCheck::writeStamp() const
 
 // --- The check's thread
 
-void DamageCheck::run()
+void DamageCheck::run(Connection connection)
 {
     giveWayToAllOthers();
-    finding_ = examine();
+    setConnection(connection.get());
+    finding_ = examine(connection.get());
+    setConnection(nullptr);
+    connection.reset();
     hasEnded_ = true;
     if (!mustEnd_ && whenFinished_)
         whenFinished_();
 }
 
-DamageCheck::Finding DamageCheck::examine()
+DamageCheck::Finding DamageCheck::examine(sqlite3* connection)
 {
-    sqlite3* opened = nullptr;
-    const int isOpen = ::sqlite3_open_v2(path_.c_str(), &opened, SQLITE_OPEN_READONLY, nullptr);
-    const auto close = [this](sqlite3* connection) {
-        setConnection(nullptr);
-        ::sqlite3_close(connection);
-    };
-    const std::unique_ptr<sqlite3, decltype(close)> connection(opened, close);
-    if (isOpen != SQLITE_OK)
+    if (connection == nullptr)
         return Finding::Unknown;
-    setConnection(opened);
     const auto mustEnd = [](void* check) { return static_cast<DamageCheck*>(check)->mustEnd_ ? 1 : 0; };
-    ::sqlite3_progress_handler(opened, 1, mustEnd, this);
+    ::sqlite3_progress_handler(connection, 1, mustEnd, this);
 
     std::string answer;
     const auto note = [](void* text, int, char** values, char**) {
         *static_cast<std::string*>(text) = values[0];
         return 0;
     };
-    const int done = ::sqlite3_exec(opened, "PRAGMA quick_check(1)", note, &answer, nullptr);
+    const int done = ::sqlite3_exec(connection, "PRAGMA quick_check(1)", note, &answer, nullptr);
     if (mustEnd_)
         return Finding::Unknown; // what was not looked at counts as missing in SQLite's answer
     if (done != SQLITE_OK)
-        return isDamage(::sqlite3_extended_errcode(opened)) ? Finding::Damaged : Finding::Unknown;
+        return isDamage(::sqlite3_extended_errcode(connection)) ? Finding::Damaged : Finding::Unknown;
     return answer == "ok" ? Finding::Sound : Finding::Damaged;
 }
 

@@ -15,6 +15,7 @@
 #include <cstdint>
 #include <filesystem>
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string_view>
 #include <thread>
@@ -44,14 +45,12 @@ public:
     DamageCheck(const DamageCheck&) = delete;
     DamageCheck& operator=(const DamageCheck&) = delete;
 
-    // Makes a check due now, before a day has passed.
-    void ask()
-    {
-        isAsked_ = true;
-        notBefore_ = 0;
-    }
-    // Begins a check if one is due and none runs.
-    void beginIfDue();
+    // Makes a check due now, before a day has passed. If it is not made in this run, the next one makes it.
+    void ask();
+    // Begins a check if one is due and none runs. It opens the file that is there, and looks at it only if then
+    // `isInPlace` says that it still is the file that the service has open: SQLite lets the connections of a process
+    // change the index of the log under each other if these have different files of the same name.
+    void beginIfDue(const std::function<bool()>& isInPlace);
     // Ends the check that runs and its use of the database, and forgets a finding that was not taken. It is repeated
     // later. Returns as soon as the check has ended.
     void breakOff();
@@ -59,8 +58,14 @@ public:
     [[nodiscard]] std::optional<Finding> takeFinding();
 
 private:
-    void run();
-    [[nodiscard]] Finding examine();
+    struct Close {
+        void operator()(sqlite3* connection) const noexcept;
+    };
+    using Connection = std::unique_ptr<sqlite3, Close>;
+
+    [[nodiscard]] Connection connect() const;
+    void run(Connection connection);
+    [[nodiscard]] Finding examine(sqlite3* connection);
     void setConnection(sqlite3* connection);
     void repeatLater();
     void writeStamp() const;

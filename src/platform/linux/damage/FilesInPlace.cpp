@@ -29,19 +29,23 @@ FilesInPlace::Change FilesInPlace::change()
     return change;
 }
 
-// SQLite makes a companion when it first needs it.
 FilesInPlace::Change FilesInPlace::compare()
 {
-    if (identityOf(path_) != database_)
+    if (!isInPlace(database_, path_))
         return Change::Database;
-    for (std::size_t each = 0; each < companions_.size(); ++each) {
-        const Identity now = identityOf(companionPaths_[each]);
-        if (companions_[each].inode == 0)
-            companions_[each] = now;
-        else if (now != companions_[each])
-            return Change::Companions;
-    }
-    return Change::None;
+    bool areInPlace = true;
+    for (std::size_t each = 0; each < companions_.size(); ++each)
+        areInPlace &= isInPlace(companions_[each], companionPaths_[each]);
+    return areInPlace ? Change::None : Change::Companions;
+}
+
+// A file that was made since and is gone already was removed before it could be noted.
+bool FilesInPlace::isInPlace(Identity& noted, const fs::path& path)
+{
+    const Identity now = identityOf(path);
+    if (noted.inode == 0)
+        noted = now;
+    return now.inode != 0 && now == noted;
 }
 
 // Compares the kernel's stamp with the kernel's clock.

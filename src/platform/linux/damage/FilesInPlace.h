@@ -33,9 +33,11 @@ public:
     // cannot have changed again at the same time.
     static constexpr std::chrono::seconds longestStep{2};
 
-    // Notes which files are there now; the database is open. A companion that is not there yet is noted later.
+    // Notes which files are there before the database is opened. Opening makes the others; they are noted when they are
+    // first looked at.
     explicit FilesInPlace(std::filesystem::path path, std::chrono::seconds step = longestStep);
 
+    // Once the database is open.
     [[nodiscard]] Change change();
     // Removes those companions that were noted and still are in their place: they belong to a database that is not.
     void removeNotedCompanions() const;
@@ -58,6 +60,7 @@ private:
     [[nodiscard]] static Identity identityOf(const std::filesystem::path& path);
     [[nodiscard]] static DirectoryState stateOf(const std::filesystem::path& directory);
     [[nodiscard]] bool isSettled(const DirectoryState& state) const;
+    [[nodiscard]] static bool isInPlace(Identity& noted, const std::filesystem::path& path);
     [[nodiscard]] Change compare();
 
     const std::filesystem::path path_;

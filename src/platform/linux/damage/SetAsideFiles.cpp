@@ -96,12 +96,17 @@ fs::path SetAsideFiles::freeName(std::string_view mark) const
 
 bool SetAsideFiles::rename(const fs::path& target) const
 {
-    for (const std::string_view suffix : databaseCompanions) {
-        std::error_code isNotThere;
-        fs::rename(withSuffix(path_, suffix), withSuffix(target, suffix), isNotThere);
-    }
+    const auto renameCompanions = [](const fs::path& from, const fs::path& to) {
+        for (const std::string_view suffix : databaseCompanions) {
+            std::error_code isNotThere;
+            fs::rename(withSuffix(from, suffix), withSuffix(to, suffix), isNotThere);
+        }
+    };
+    renameCompanions(path_, target);
     std::error_code error;
     fs::rename(path_, target, error);
+    if (error)
+        renameCompanions(target, path_);
     return !error;
 }
 

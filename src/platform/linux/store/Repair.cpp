@@ -4,6 +4,7 @@
 #include "platform/linux/store/tables/SalvagedTables.h"
 
 #include <algorithm>
+#include <tuple>
 
 namespace platform {
 
@@ -29,11 +30,23 @@ StoreExpected<bool> Repair::begin(SqliteEventFile& database)
         salvages_.push_back(*std::move(begun));
     }
     if (salvages_.empty())
-        return false;
+        return finishEarlier(database);
     const auto hasMore = [](const std::unique_ptr<Salvage>& salvage) { return salvage->hasMore(); };
     if (std::ranges::none_of(salvages_, hasMore))
         if (const auto done = finish(database); !done)
             return std::unexpected(done.error());
+    return true;
+}
+
+// A database may be there whose saving was begun, but nothing to save from any more: it is an old copy, or its
+// origin was removed.
+StoreExpected<bool> Repair::finishEarlier(SqliteEventFile& database)
+{
+    const auto isBegun = SalvagedTables::isBegun(database.connection());
+    if (!isBegun || !*isBegun)
+        return isBegun;
+    if (const auto done = finish(database); !done)
+        return std::unexpected(done.error());
     return true;
 }
 
@@ -49,6 +62,9 @@ StoreExpected<> Repair::finish(SqliteEventFile& database)
 {
     if (const auto done = SalvagedTables::finish(database.connection()); !done)
         return done;
+    // What is saved must be on the disk before its origin counts for nothing. If a reader needs the log, it can only be
+    // lost together with the log.
+    std::ignore = database.connection().emptyLog(waitForReaders);
     for (const std::unique_ptr<Salvage>& salvage : std::exchange(salvages_, {})) {
         SetAsideFiles::markSaved(salvage->damaged());
         savedMessages_ += salvage->messages();

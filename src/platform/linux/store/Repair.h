@@ -10,6 +10,7 @@
 #include "platform/linux/store/SqliteEventFile.h"
 #include "platform/linux/store/StoreError.h"
 
+#include <chrono>
 #include <cstdint>
 #include <filesystem>
 #include <memory>
@@ -44,6 +45,9 @@ public:
     [[nodiscard]] std::uint64_t takeSavedMessages() noexcept { return std::exchange(savedMessages_, 0); }
 
 private:
+    static constexpr std::chrono::milliseconds waitForReaders{200};
+
+    [[nodiscard]] StoreExpected<bool> finishEarlier(SqliteEventFile& database);
     [[nodiscard]] StoreExpected<> finish(SqliteEventFile& database);
 
     const std::filesystem::path path_;

@@ -46,6 +46,9 @@ StoreError errorOf(sqlite3* connection)
     case SQLITE_IOERR: return errorOfDisk(connection);
     case SQLITE_CORRUPT:
     case SQLITE_NOTADB: return StoreError::Corrupt;
+    case SQLITE_CONSTRAINT: // rows of the service keep the rules of a sound database; a trigger is another program's
+        return ::sqlite3_extended_errcode(connection) == SQLITE_CONSTRAINT_TRIGGER ? StoreError::Other
+                                                                                   : StoreError::Corrupt;
     default: return StoreError::Other;
     }
 }

@@ -103,10 +103,19 @@ SqliteKeeper::Expected<> SqliteKeeper::openAnew()
     repair_.finishRenaming();
     if (hasContent(withSuffix(path_, "-wal")))
         check_.ask(); // a service that ends in order leaves an empty log
+    auto done = connectAndRepair();
+    if (!done && files_->change() == FilesInPlace::Change::Database)
+        done = connectAndRepair(); // it was removed or replaced while it was opened
+    if (done || (done.error() != StoreError::Corrupt && done.error() != StoreError::Newer))
+        return done;
+    close();
+    return repair_.setAside(done.error()) ? connectAndRepair() : done;
+}
+
+// When this returns, the database has what must be saved before it takes events.
+SqliteKeeper::Expected<> SqliteKeeper::connectAndRepair()
+{
     auto done = connect();
-    if (!done && (done.error() == StoreError::Corrupt || done.error() == StoreError::Newer)
-        && repair_.setAside(done.error()))
-        done = connect();
     if (!done)
         return done;
     const auto isDamaged = repair_.begin(*database_);
@@ -122,11 +131,11 @@ SqliteKeeper::Expected<> SqliteKeeper::openAnew()
 SqliteKeeper::Expected<> SqliteKeeper::connect()
 {
     close();
+    files_.emplace(path_);
     auto opened = SqliteEventFile::open(path_, clock_, origins_);
     if (!opened)
         return std::unexpected(opened.error());
     database_ = *std::move(opened);
-    files_.emplace(path_);
     bytes_ = 0;
     oldest_ = 0;
     hasMoreToTidy_ = true; // which also completes the state
@@ -312,10 +321,11 @@ void SqliteKeeper::heedCheck()
 {
     if (!database_)
         return;
-    if (database_->logBytes() > maximumBytes() / 2 || files_->change() != FilesInPlace::Change::None)
+    const auto areInPlace = [this] { return files_->change() == FilesInPlace::Change::None; };
+    if (database_->logBytes() > maximumBytes() / 2 || !areInPlace())
         check_.breakOff();
     else if (repair_.isDone())
-        check_.beginIfDue();
+        check_.beginIfDue(areInPlace);
     if (check_.takeFinding() == DamageCheck::Finding::Damaged)
         handleFailure(StoreError::Corrupt);
 }

@@ -62,6 +62,7 @@ private:
 
     [[nodiscard]] Expected<> ensureOpen();
     [[nodiscard]] Expected<> openAnew();
+    [[nodiscard]] Expected<> connectAndRepair();
     [[nodiscard]] Expected<> connect();
     void close();
     [[nodiscard]] bool areFilesInPlace();

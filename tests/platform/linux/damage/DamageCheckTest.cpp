@@ -47,11 +47,15 @@ protected:
         return *check_;
     }
     void forget() { check_.reset(); }
+    void begin()
+    {
+        check().beginIfDue([] { return true; });
+    }
     // What a check finds that is due; nothing if none is.
     std::optional<Finding> finding()
     {
         const int before = ended();
-        check().beginIfDue();
+        begin();
         std::unique_lock lock(mutex_);
         changed_.wait_for(lock, isDue_ ? 20s : 0s, [&] { return ended_ > before; });
         lock.unlock();
@@ -150,6 +154,34 @@ TEST_F(DamageCheckTest, ACheckThatIsAskedForDoesNotWaitADay)
     EXPECT_THAT(finding(), Optional(Finding::Sound));
 }
 
+TEST_F(DamageCheckTest, ACheckThatIsAskedForAndNotMadeIsDueAtTheNextStart)
+{
+    EXPECT_THAT(finding(), Optional(Finding::Sound));
+    check().ask();
+    forget();
+    EXPECT_THAT(finding(), Optional(Finding::Sound));
+    expectNone();
+    forget();
+    EXPECT_EQ(finding(), std::nullopt);
+}
+
+TEST_F(DamageCheckTest, ADatabaseThatWasReplacedIsNotLookedAtAndTheCheckStaysDue)
+{
+    check().beginIfDue([] { return false; });
+    EXPECT_EQ(check().takeFinding(), std::nullopt);
+    EXPECT_EQ(ended(), 0);
+    EXPECT_THAT(finding(), Optional(Finding::Sound));
+}
+
+TEST_F(DamageCheckTest, TheFileThatWasInPlaceIsLookedAtAlsoIfItIsReplacedRightAfter)
+{
+    check().beginIfDue([this] {
+        support::replaceFile(file, "not a database");
+        return true;
+    });
+    EXPECT_THAT(finding(), Optional(Finding::Sound));
+}
+
 TEST_F(DamageCheckTest, ACheckThatIsBrokenOffIsNoCheck)
 {
     {
@@ -157,7 +189,7 @@ TEST_F(DamageCheckTest, ACheckThatIsBrokenOffIsNoCheck)
         writer.execute("WITH RECURSIVE n(i) AS (SELECT 5001 UNION ALL SELECT i + 1 FROM n WHERE i < 200000) "
                        "INSERT INTO t SELECT i, printf('%.*c', 300, 'x') FROM n");
     }
-    check().beginIfDue();
+    begin();
     check().breakOff();
     EXPECT_EQ(check().takeFinding(), std::nullopt);
     EXPECT_FALSE(fs::exists(temporary / "db-checked"));

@@ -59,6 +59,28 @@ TEST_P(FilesInPlaceTest, ARemovedFileIsNoticed)
     EXPECT_EQ(files.change(), Change::Database);
 }
 
+TEST_P(FilesInPlaceTest, FilesThatComeAfterwardsAreNoted)
+{
+    for (const char* name : {"other-wal", "other-shm", "other"}) {
+        FilesInPlace later(temporary / "other", GetParam());
+        for (const char* made : {"other", "other-wal", "other-shm"})
+            support::writeFile(temporary / made, "first");
+        EXPECT_EQ(later.change(), Change::None);
+        fs::remove(temporary / name);
+        EXPECT_EQ(later.change(), std::string_view(name) == "other" ? Change::Database : Change::Companions);
+        for (const char* made : {"other", "other-wal", "other-shm"})
+            fs::remove(temporary / made);
+    }
+}
+
+TEST_P(FilesInPlaceTest, AFileThatWasRemovedBeforeItCouldBeNotedIsMissed)
+{
+    FilesInPlace later(temporary / "other", GetParam());
+    EXPECT_EQ(later.change(), Change::Database);
+    support::writeFile(temporary / "other", "first");
+    EXPECT_EQ(later.change(), Change::Companions);
+}
+
 TEST_P(FilesInPlaceTest, AReplacedFileIsNoticedEachTime)
 {
     for (const auto& [name, expected] : {std::pair("db-shm", Change::Companions),

@@ -61,6 +61,15 @@ TEST_F(SetAsideFilesTest, WithoutADatabaseNothingIsSetAsideOrMarked)
     EXPECT_THAT(names(), IsEmpty());
 }
 
+TEST_F(SetAsideFilesTest, FilesBesideADatabaseThatIsGoneStayInTheirPlace)
+{
+    makeDatabase();
+    fs::remove(database);
+    EXPECT_EQ(files.setAsideDamaged(), std::nullopt);
+    EXPECT_THAT(names(), ElementsAre("db-shm", "db-wal"));
+    EXPECT_EQ(support::readFile(database.string() + "-wal"), "text-wal");
+}
+
 TEST_F(SetAsideFilesTest, TheOldestIsRemovedWithAllThatBelongsToIt)
 {
     for (int number = 0; number < 4; ++number) {

@@ -9,14 +9,17 @@
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
 
+#include <atomic>
 #include <chrono>
 #include <csignal>
 #include <fmt/format.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <memory>
+#include <sqlite3.h>
 #include <sys/wait.h>
 #include <thread>
+#include <tuple>
 #include <unistd.h>
 
 namespace platform {
@@ -189,6 +192,17 @@ public:
         return saved(seed);
     }
 
+    // Opening the database needs some pages, and not others.
+    void expectNothingLostThatComesAfter(std::uint64_t damagedPage)
+    {
+        keepAndClose(100);
+        support::overwrite(file, (damagedPage - 1) * pageSize, std::string(pageSize, '\xFF'));
+        keep(10, "com.quarn.after");
+        passADay();
+        expectSumsToHold(fmt::format("page {}", damagedPage));
+        EXPECT_EQ(storedEvents("com.quarn.after"), 10) << damagedPage;
+    }
+
 private:
     std::int64_t saved(unsigned seed)
     {
@@ -212,6 +226,12 @@ TEST(RandomPages, OfARunningServiceCostOnlyTheirEvents)
     for (unsigned seed = 1; seed <= seeds; ++seed)
         saved += OfASeed().savedIfRunning(seed);
     EXPECT_EQ(saved, 92'656); // of 100,000
+}
+
+TEST(RandomPages, WhicheverItIsNothingIsLostThatComesAfter)
+{
+    for (std::uint64_t page = 1; page <= 24; ++page)
+        OfASeed().expectNothingLostThatComesAfter(page);
 }
 
 // --- Other damage
@@ -265,6 +285,54 @@ TEST_F(StoreDamageTest, ADatabaseThatIsRemovedUnderTheServiceCostsNothingThatCom
     expectSumsToHold("removed");
     EXPECT_EQ(storedEvents("com.quarn.after"), 10);
     EXPECT_EQ(lostToDamage(), 1001U);
+}
+
+// Removes the database when a connection runs a statement with these words for the first time.
+class RemovalAtStatement {
+public:
+    RemovalAtStatement(fs::path file, std::string_view words) : file_(std::move(file)), words_(words)
+    {
+        present = this;
+        ::sqlite3_auto_extension(reinterpret_cast<void (*)()>(watch));
+    }
+    ~RemovalAtStatement()
+    {
+        ::sqlite3_cancel_auto_extension(reinterpret_cast<void (*)()>(watch));
+        present = nullptr;
+    }
+    RemovalAtStatement(const RemovalAtStatement&) = delete;
+    RemovalAtStatement& operator=(const RemovalAtStatement&) = delete;
+
+    [[nodiscard]] bool hasHappened() const { return hasHappened_; }
+
+private:
+    static int watch(sqlite3* connection) { return ::sqlite3_trace_v2(connection, SQLITE_TRACE_STMT, see, nullptr); }
+    static int see(unsigned, void*, void*, void* text)
+    {
+        if (present != nullptr && !present->hasHappened_
+            && std::string_view(static_cast<const char*>(text)).contains(present->words_)) {
+            present->hasHappened_ = true;
+            fs::remove(present->file_);
+        }
+        return 0;
+    }
+
+    static inline RemovalAtStatement* present = nullptr;
+    const fs::path file_;
+    const std::string_view words_;
+    std::atomic<bool> hasHappened_ = false;
+};
+
+TEST_F(StoreDamageTest, ADatabaseThatIsRemovedWhileItIsMadeOrOpenedCostsNothingThatComesAfter)
+{
+    for (const char* words : {"CREATE TABLE messages", "journal_mode", "UPDATE store"}) {
+        const RemovalAtStatement removal(file, words);
+        keep(10);
+        EXPECT_TRUE(removal.hasHappened()) << words;
+        keep(10);
+        EXPECT_EQ(ledger.account().sum(ledger::Charge::Lost), 0U) << words;
+        expectSumsToHold(words);
+    }
 }
 
 TEST_F(StoreDamageTest, ADatabaseThatIsReplacedUnderTheServiceCostsNothingThatComesAfter)
@@ -345,6 +413,18 @@ TEST_F(StoreDamageTest, ANumberThatNoEventCanHaveIsNotSaved)
     settle();
     EXPECT_EQ(storedEvents("com.quarn.kept"), 10);
     EXPECT_EQ(storedEvents("com.quarn.after"), 1);
+}
+
+// As when only some pages of a copy are old.
+TEST_F(StoreDamageTest, ADatabaseWhoseRowsContradictEachOtherIsDamaged)
+{
+    keepAndClose(1000);
+    support::Writer(file).execute("UPDATE store SET next_event = 990, kept = 989");
+    keep(20, "com.quarn.after");
+    settle();
+    expectSumsToHold("contradiction");
+    EXPECT_EQ(storedEvents("com.quarn.kept"), 1000);
+    EXPECT_EQ(storedEvents("com.quarn.after"), 20);
 }
 
 TEST_F(StoreDamageTest, EventsOfTheFirstEditionAreSavedAndMoved)
@@ -495,6 +575,55 @@ TEST_F(StoreDamageTest, AServiceThatIsKilledWhileItSavesGoesOnAtTheNextStart)
     }
     EXPECT_EQ(StoreReader(file).number("SELECT max(id) - min(id) + 1 - count(*) FROM events"), 0);
 }
+
+TEST_F(StoreDamageTest, ALogThatGoesWithTheServiceCostsNothingThatWasSaved)
+{
+    keepAndClose(10'000);
+    support::overwrite(file, 0, std::string(pageSize, 'x'));
+    const pid_t child = ::fork();
+    if (child == 0) {
+        SqliteKeeper keeper(directory.path(), clock, ProviderLog(log));
+        ledger::Tally tally;
+        keeper.open();
+        StoreReader reader(file); // as long as it is connected, closing does not empty the log
+        std::ignore = reader.eventCount();
+        while (!keeper.state())
+            std::ignore = keeper.tidy(true, tally);
+        ::raise(SIGKILL);
+    }
+    ASSERT_EQ(::waitpid(child, nullptr, 0), child);
+    EXPECT_THAT(filesNamed("-unsaved"), IsEmpty());
+    fs::remove(file.string() + "-wal");
+    keep(1);
+    expectSumsToHold("without a log");
+    EXPECT_EQ(storedEvents(), 10'001);
+}
+
+class UnfinishedSavingTest : public StoreDamageTest, public testing::WithParamInterface<bool> { };
+
+TEST_P(UnfinishedSavingTest, CountsWhatItHas)
+{
+    keepAndClose(10'000);
+    support::overwrite(file, 0, std::string(pageSize, 'x'));
+    {
+        SqliteKeeper keeper(directory.path(), clock, ProviderLog(log));
+        ledger::Tally tally;
+        keeper.open();
+        ASSERT_TRUE(keeper.tidy(true, tally));
+    }
+    for (const std::string& mark : filesNamed("-unsaved")) // by hand, or because the database is an old copy
+        fs::remove(directory / mark);
+    if (GetParam())
+        support::Writer(file).execute("DROP VIEW events; DROP TABLE first_edition");
+    keep(1, "com.quarn.after");
+    expectSumsToHold("without its mark");
+    EXPECT_GT(storedEvents("com.quarn.kept"), 0);
+    EXPECT_EQ(storedEvents("com.quarn.after"), 1);
+    EXPECT_EQ(lostToDamage(), 10'000U - static_cast<std::uint64_t>(storedEvents("com.quarn.kept")));
+}
+
+INSTANTIATE_TEST_SUITE_P(Steps, UnfinishedSavingTest, testing::Bool(),
+                         [](const auto& test) { return test.param ? "WithoutTheLastStep" : "WithoutTheLastSteps"; });
 
 TEST_F(StoreDamageTest, NewEventsAreKeptBeforeTheOldOnesAreSaved)
 {

@@ -91,6 +91,14 @@ StoreExpected<> SalvagedTables::begin(SqliteConnection& connection, std::int64_t
     return inTransaction(connection, fmt::format(goOn, last, mayHaveMore));
 }
 
+StoreExpected<bool> SalvagedTables::isBegun(SqliteConnection& connection)
+{
+    const auto places = connection.number("SELECT count(*) FROM kinds WHERE name = ''");
+    if (!places)
+        return std::unexpected(places.error());
+    return *places != 0;
+}
+
 StoreExpected<> SalvagedTables::finish(SqliteConnection& connection)
 {
     const auto events = connection.number("SELECT count(*) FROM (SELECT id FROM first_edition LIMIT 1)");

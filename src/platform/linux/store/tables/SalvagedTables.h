@@ -31,6 +31,8 @@ public:
     // damaged database may have given out: it `mayHaveMore` if its own count could not be read.
     [[nodiscard]] static StoreExpected<> begin(SqliteConnection& connection, std::int64_t last,
                                                std::int64_t mayHaveMore);
+    // Whether that was begun and not finished.
+    [[nodiscard]] static StoreExpected<bool> isBegun(SqliteConnection& connection);
     // When everything is copied: counts the events. The database must be opened again then.
     [[nodiscard]] static StoreExpected<> finish(SqliteConnection& connection);
 

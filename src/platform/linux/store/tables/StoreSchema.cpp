@@ -128,7 +128,8 @@ StoreExpected<> StoreSchema::makeFirstEdition(SqliteConnection& connection)
 StoreExpected<> StoreSchema::dropFirstEdition(SqliteConnection& connection)
 {
     return connection.execute(
-        fmt::format("BEGIN IMMEDIATE; DROP VIEW events; DROP TABLE first_edition; {}; COMMIT", view).c_str());
+        fmt::format("BEGIN IMMEDIATE; DROP VIEW IF EXISTS events; DROP TABLE IF EXISTS first_edition; {}; COMMIT", view)
+            .c_str());
 }
 
 StoreExpected<StoreCountsRow> StoreCountsRow::open(SqliteConnection& connection, double wall)
