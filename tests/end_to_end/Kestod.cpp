@@ -51,6 +51,19 @@ Kestod::~Kestod()
         std::fprintf(stderr, "--- log of the service:\n%s", log().c_str());
 }
 
+void Kestod::shiftClock(std::chrono::seconds shift)
+{
+    const fs::path path = directory() / "clock-shift";
+    environment_["KESTO_TEST_CLOCK_SHIFT"] = path;
+    environment_["LD_PRELOAD"] = SHIFTED_CLOCK_PATH;
+    const std::int64_t seconds = shift.count();
+    const int file = ::open(path.c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);
+    const bool isWritten = ::pwrite(file, &seconds, sizeof seconds, 0) == sizeof seconds; // the process has it mapped
+    ::close(file);
+    if (!isWritten)
+        throw std::runtime_error("the clock cannot be shifted");
+}
+
 void Kestod::startAndAwait()
 {
     start();

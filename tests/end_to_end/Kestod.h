@@ -63,6 +63,9 @@ public:
     // Needs the right to mount.
     void hide(const std::filesystem::path& folder) { hidden_ = folder; }
 
+    // From the next start on the process sees the time of day shifted by so much; further calls take effect at once.
+    void shiftClock(std::chrono::seconds shift);
+
     // Starts the process; clients that connect immediately must wait until it listens.
     void start(const InheritedDescriptors& inherited = {});
     // The same, for clients that do not wait: returns when the service listens.

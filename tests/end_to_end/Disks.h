@@ -1,0 +1,76 @@
+// Disks that are small or read-only, in place of the service's state directory or over its database. They need the right
+// to mount, which root has.
+#pragma once
+
+#include <cerrno>
+#include <fcntl.h>
+#include <filesystem>
+#include <string>
+#include <sys/mount.h>
+#include <system_error>
+#include <unistd.h>
+
+namespace end_to_end {
+
+// Mounts at a directory, and takes the mount away at the end; files that are open then stay usable.
+class Mount {
+public:
+    Mount(const Mount&) = delete;
+    Mount& operator=(const Mount&) = delete;
+
+    // Whether the system allowed it.
+    [[nodiscard]] explicit operator bool() const noexcept { return isMounted_; }
+
+protected:
+    explicit Mount(std::filesystem::path place) : place_(std::move(place)) { }
+    ~Mount()
+    {
+        if (isMounted_)
+            ::umount2(place_.c_str(), MNT_DETACH);
+    }
+
+    const std::filesystem::path place_;
+    bool isMounted_ = false;
+};
+
+// An empty disk of that size.
+class SmallDisk : public Mount {
+public:
+    SmallDisk(std::filesystem::path place, const std::string& size) : Mount(std::move(place))
+    {
+        isMounted_ = ::mount("none", place_.c_str(), "tmpfs", 0, ("size=" + size).c_str()) == 0;
+    }
+
+    // Leaves no room at all.
+    void fill() const
+    {
+        const int file = ::open(ballast().c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);
+        off_t size = 0;
+        for (off_t step = 1 << 20; step >= 4096; step /= 2)
+            while (::posix_fallocate(file, size, step) == 0)
+                size += step;
+        ::close(file);
+    }
+    void free() const
+    {
+        std::error_code error;
+        std::filesystem::remove(ballast(), error);
+    }
+
+private:
+    [[nodiscard]] std::filesystem::path ballast() const { return place_ / "ballast"; }
+};
+
+// The same file or directory, without the right to write to it. Programs that have it open are not hindered.
+class ReadOnlyView : public Mount {
+public:
+    explicit ReadOnlyView(std::filesystem::path place) : Mount(std::move(place))
+    {
+        isMounted_ = ::mount(place_.c_str(), place_.c_str(), nullptr, MS_BIND, nullptr) == 0;
+        if (isMounted_
+            && ::mount(nullptr, place_.c_str(), nullptr, MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr) != 0)
+            throw std::system_error(errno, std::generic_category(), "mounting read-only");
+    }
+};
+
+} // namespace end_to_end
