@@ -1,13 +1,17 @@
 // Faults of every kind, and what the ledger says after each: nothing goes uncounted.
+#include "end_to_end/Disks.h"
 #include "end_to_end/Kestod.h"
-#include "end_to_end/SmallDisk.h"
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
+#include "platform/linux/damage/DatabaseDamage.h"
+#include "support/Sanitizers.h"
 
 #include <atomic>
 #include <cmath>
+#include <csignal>
 #include <gmock/gmock.h>
-#include <sqlite3.h>
+#include <random>
+#include <stdexcept>
 #include <thread>
 #include <tuple>
 #include <unistd.h>
@@ -47,11 +51,31 @@ protected:
             client.ask(SendMessage, Dictionary{{"n", ++sent}, {"text", std::string(size, 'x')}}, playback, typeStart,
                        Array{1});
     }
+    // For sums that do not hold at once: events come outside answers, or the store is being repaired.
+    void expectSumsInTime()
+    {
+        WireClient client = connect();
+        waitUntil([&] {
+            send(client, 1);
+            return areSumsWhole();
+        });
+        EXPECT_THAT(brokenSums(kestod), IsEmpty());
+    }
     [[nodiscard]] fs::path store() const { return kestod.directory() / "state" / "analytics.sqlite3"; }
     [[nodiscard]] std::uint64_t counted(Counter counter) const { return readLedger(kestod)[counter]; }
 
     Kestod kestod;
     std::int64_t sent = 0;
+
+private:
+    [[nodiscard]] bool areSumsWhole() const
+    {
+        try {
+            return brokenSums(kestod).empty();
+        } catch (const std::runtime_error&) {
+            return false; // the store is being exchanged
+        }
+    }
 };
 
 TEST_F(FaultsTest, EachMessageIsCountedByWhatBecameOfIt)
@@ -100,19 +124,63 @@ TEST_F(FaultsTest, SessionsAndReceiversBeyondTheirCapsAreCountedAsRefused)
     EXPECT_EQ(readLedger(kestod).culprits[0].at(0).culprit.user, ::getuid());
 }
 
-TEST_F(FaultsTest, AStoreThatAnotherProgramLocksLosesWhatItCountsAsLost)
+TEST_F(FaultsTest, AMessageToMoreReceiversThanAFrameMayNameEndsTheConnection)
+{
+    WireClient client = connect();
+    client.call(SendMessage, Dictionary{{"a", 1}}, playback, typeStart, Array(std::vector<Value>(10'001, Value(1))));
+    EXPECT_TRUE(client.isClosed());
+    WireClient other = connect();
+    send(other, 1);
+    EXPECT_EQ(counted(Counter::Deliveries), 1U);
+    EXPECT_THAT(brokenSums(kestod), IsEmpty());
+}
+
+// A client may have a GiB. No event is wanted, so the store stays small.
+class MemoryUsedUpTest : public FaultsTest {
+protected:
+    MemoryUsedUpTest() : FaultsTest(Kestod::Files{{"analytics.toml", "used = []\n"}}) { }
+};
+
+TEST_F(MemoryUsedUpTest, MessagesBeyondTheMemoryAreCountedAsRefused)
+{
+    KESTO_SKIP_WHERE_MEMORY_IS_WATCHED();
+    constexpr int sessions = 60;
+    constexpr std::uint64_t messages = 20;
+    WireClient client(kestod.socketPath());
+    std::vector<Value> receivers;
+    for (int session = 1; session <= sessions; ++session) {
+        client.ask(Create, session);
+        client.call(Start, session);
+        client.ask(Validate, session);
+        receivers.emplace_back(session);
+    }
+    for (std::uint64_t number = 0; number < messages; ++number)
+        client.ask(SendMessage, Dictionary{{"n", number}, {"text", std::string(1'000'000, 'x')}}, playback, typeStart,
+                   Array(receivers));
+    EXPECT_EQ(counted(Counter::Deliveries), messages * sessions);
+    EXPECT_GT(counted(Counter::Recorded), 1000U);
+    EXPECT_GT(counted(Counter::RefusedForMemory), 100U);
+    EXPECT_EQ(counted(Counter::RefusedForSize), 0U);
+    EXPECT_THAT(brokenSums(kestod), IsEmpty());
+}
+
+// The longest time that the suite waits for. The service waits two seconds for each transaction.
+TEST_F(FaultsTest, AStoreThatAnotherProgramLocksForTwentySecondsLosesWhatItCountsAsLost)
 {
     WireClient client = connect();
     send(client, 5);
-    sqlite3* other = nullptr;
-    ASSERT_EQ(sqlite3_open(store().c_str(), &other), SQLITE_OK);
-    sqlite3_busy_timeout(other, 10'000);
-    ASSERT_EQ(sqlite3_exec(other, "BEGIN IMMEDIATE", nullptr, nullptr, nullptr), SQLITE_OK);
-    send(client, 2);
-    ASSERT_EQ(sqlite3_exec(other, "ROLLBACK", nullptr, nullptr, nullptr), SQLITE_OK);
-    sqlite3_close(other);
+    const auto end = std::chrono::steady_clock::now() + std::chrono::seconds(20);
+    {
+        support::Writer other(store());
+        other.execute("PRAGMA busy_timeout = 10000");
+        other.execute("BEGIN IMMEDIATE");
+        while (std::chrono::steady_clock::now() < end)
+            send(client, 1);
+    }
+    const auto lost = static_cast<std::uint64_t>(2 * (sent - 5));
     send(client, 5);
-    EXPECT_EQ(counted(Counter::LostToLock), 4U);
+    EXPECT_EQ(counted(Counter::LostToLock), lost);
+    EXPECT_GE(lost, 10U);
     EXPECT_EQ(counted(Counter::Kept), 20U);
     EXPECT_THAT(brokenSums(kestod), IsEmpty());
 }
@@ -164,17 +232,84 @@ TEST_F(FaultsTest, AStoreThatIsTruncatedWhileTheServiceIsStopped)
     EXPECT_THAT(brokenSums(kestod), IsEmpty());
 }
 
+TEST_F(FaultsTest, AStoreThatIsTruncatedWhileTheServiceRuns)
+{
+    WireClient client = connect();
+    send(client, 200, 1000);
+    kestod.kill();
+    kestod.startAndAwait();
+    WireClient again = connect();
+    send(again, 5);
+    fs::resize_file(store(), fs::file_size(store()) / 2);
+    send(again, 200, 1000);
+    kestod.kill();
+    kestod.startAndAwait(); // looks at every page, because its end was not clean
+    expectSumsInTime();
+}
+
+TEST_F(FaultsTest, ALogThatIsRemovedWhileTheServiceRunsCostsNoEvent)
+{
+    WireClient client = connect();
+    send(client, 100);
+    fs::remove(store().native() + "-wal");
+    send(client, 100);
+    kestod.kill();
+    kestod.startAndAwait();
+    WireClient again = connect();
+    send(again, 1);
+    EXPECT_EQ(counted(Counter::RemovedByDamage), 0U);
+    EXPECT_GE(kestod.eventCount(), 402U);
+    expectSumsInTime();
+}
+
+// By the seed of what is overwritten, and whether the service runs meanwhile.
+class OverwrittenPagesTest : public FaultsTest, public testing::WithParamInterface<std::tuple<unsigned, bool>> { };
+
+TEST_P(OverwrittenPagesTest, CostOnlyEventsThatAreCounted)
+{
+    constexpr std::uint64_t pageSize = 8192;
+    const auto [seed, runs] = GetParam();
+    std::mt19937 random(seed);
+    WireClient client = connect();
+    send(client, 300, 1000);
+    kestod.kill();
+    kestod.startAndAwait();
+    WireClient again = connect();
+    send(again, 5); // the log is in the database now
+    if (!runs)
+        kestod.kill();
+    support::overwriteRandomPages(store(), 1 + seed % 8, random, pageSize);
+    if (runs) {
+        send(again, 100, 1000);
+        kestod.kill();
+    }
+    kestod.startAndAwait();
+    expectSumsInTime();
+    const std::uint64_t kept = counted(Counter::Kept);
+    WireClient last = connect();
+    send(last, 10);
+    EXPECT_GE(counted(Counter::Kept), kept + 20);
+}
+
+INSTANTIATE_TEST_SUITE_P(OfSeed, OverwrittenPagesTest, testing::Combine(testing::Range(1U, 9U), testing::Bool()),
+                         [](const auto& test) {
+                             return std::to_string(std::get<0>(test.param))
+                                 + (std::get<1>(test.param) ? "WhileRunning" : "WhileStopped");
+                         });
+
+// --- Disks
+
+// The disk of the state directory has 2 MB.
 class FullDiskTest : public FaultsTest {
 protected:
     void SetUp() override
     {
-        if (!disk.isMounted())
+        if (!disk)
             GTEST_SKIP() << "needs the right to mount";
         FaultsTest::SetUp();
     }
-    void TearDown() override { kestod.kill(); }
 
-    const SmallDisk disk{kestod.directory() / "state"};
+    const SmallDisk disk{kestod.directory() / "state", "2m"};
 };
 
 TEST_F(FullDiskTest, ADiskThatIsFullAndFreeAgainLosesWhatItCountsAsLost)
@@ -185,7 +320,7 @@ TEST_F(FullDiskTest, ADiskThatIsFullAndFreeAgainLosesWhatItCountsAsLost)
     send(client, 100, 4000);
     EXPECT_GT(counted(Counter::LostToDiskFull), 0U);
     EXPECT_THAT(brokenSums(kestod), IsEmpty());
-    disk.makeRoom();
+    disk.free();
     const std::uint64_t kept = counted(Counter::Kept);
     send(client, 10);
     EXPECT_EQ(counted(Counter::Kept), kept + 20) << "it keeps events again";
@@ -193,7 +328,76 @@ TEST_F(FullDiskTest, ADiskThatIsFullAndFreeAgainLosesWhatItCountsAsLost)
     EXPECT_EQ(counted(Counter::Events), 240U);
 }
 
-// --- Kills
+TEST_F(FaultsTest, AStoreThatIsReadOnlyAndWritableAgainLosesWhatItCountsAsLost)
+{
+    WireClient client = connect();
+    send(client, 10);
+    kestod.kill();
+    {
+        const ReadOnlyView view(store());
+        if (!view)
+            GTEST_SKIP() << "needs the right to mount";
+        kestod.start();
+        client = connect();
+        send(client, 10);
+        EXPECT_EQ(counted(Counter::LostToReadOnly), 20U);
+        EXPECT_THAT(brokenSums(kestod), IsEmpty());
+    }
+    EXPECT_TRUE(waitUntil([&] { // it tries again every second
+        send(client, 1);
+        return counted(Counter::Kept) > 20;
+    }));
+    EXPECT_THAT(brokenSums(kestod), IsEmpty());
+}
+
+// --- Clocks
+
+class ClockTest : public FaultsTest, public testing::WithParamInterface<std::chrono::days> {
+protected:
+    void SetUp() override
+    {
+        kestod.shiftClock(std::chrono::seconds(0));
+        FaultsTest::SetUp();
+    }
+};
+
+TEST_P(ClockTest, ThatIsSetWhileTheServiceRunsCostsNoEvent)
+{
+    WireClient client = connect();
+    send(client, 10);
+    kestod.shiftClock(GetParam());
+    send(client, 10);
+    kestod.kill();
+    kestod.startAndAwait();
+    WireClient again = connect();
+    send(again, 10);
+    const double shift = std::chrono::duration<double>(GetParam()).count();
+    const std::vector<std::string> times =
+        kestod.query("SELECT time FROM events WHERE name GLOB '*.Start' ORDER BY id");
+    ASSERT_EQ(times.size(), 60U);
+    EXPECT_NEAR(std::stod(times.back()) - std::stod(times.front()), shift, 100) << "the service saw the clock";
+    EXPECT_EQ(readLedger(kestod).sum(ledger::Charge::Removed), 0U);
+    expectSumsInTime();
+}
+
+TEST_P(ClockTest, ThatIsSetWhileTheServiceIsStoppedCostsNoEvent)
+{
+    WireClient client = connect();
+    send(client, 10);
+    kestod.kill();
+    kestod.shiftClock(GetParam());
+    kestod.start();
+    WireClient again = connect();
+    send(again, 10);
+    EXPECT_EQ(counted(Counter::Kept), 40U);
+    EXPECT_EQ(readLedger(kestod).sum(ledger::Charge::Removed), 0U);
+    expectSumsInTime();
+}
+
+INSTANTIATE_TEST_SUITE_P(By, ClockTest, testing::Values(std::chrono::days(91), std::chrono::days(-3653)),
+                         [](const auto& shift) { return shift.param.count() > 0 ? "NinetyOneDays" : "TenYearsBack"; });
+
+// --- Ends under load
 
 // A client that sends as fast as it gets answers, until the service goes. Counts answered messages.
 void sendUntilTheEnd(const fs::path& socket, std::atomic<std::uint64_t>& answered)
@@ -217,9 +421,36 @@ void sendUntilTheEnd(const fs::path& socket, std::atomic<std::uint64_t>& answere
     }
 }
 
-class KilledUnderLoadTest : public FaultsTest, public testing::WithParamInterface<bool> { };
+enum class End : std::uint8_t { BySigkill, ByKillService, BySigterm };
+const char* nameOf(End end)
+{
+    switch (end) {
+    case End::BySigkill: return "BySigkill";
+    case End::ByKillService: return "ByKillService";
+    case End::BySigterm: break;
+    }
+    return "BySigterm";
+}
 
-TEST_P(KilledUnderLoadTest, WhatWasAnsweredIsCountedAndKept)
+class EndUnderLoadTest : public FaultsTest, public testing::WithParamInterface<End> {
+protected:
+    void end()
+    {
+        switch (GetParam()) {
+        case End::BySigkill: return kestod.kill();
+        case End::ByKillService:
+            WireClient(kestod.socketPath()).call(KillService);
+            EXPECT_EQ(kestod.exitStatus(), 2);
+            return;
+        case End::BySigterm:
+            kestod.signal(SIGTERM);
+            EXPECT_EQ(kestod.exitStatus(), 0);
+            return;
+        }
+    }
+};
+
+TEST_P(EndUnderLoadTest, WhatWasAnsweredIsCountedAndKept)
 {
     std::atomic<std::uint64_t> answered = 0;
     constexpr int rounds = 10;
@@ -232,12 +463,7 @@ TEST_P(KilledUnderLoadTest, WhatWasAnsweredIsCountedAndKept)
                 clients.emplace_back([&] { sendUntilTheEnd(kestod.socketPath(), answered); });
             const std::uint64_t before = answered;
             EXPECT_TRUE(waitUntil([&] { return answered > before + 100; }));
-            if (GetParam()) {
-                WireClient(kestod.socketPath()).call(KillService);
-                EXPECT_EQ(kestod.exitStatus(), 2);
-            } else {
-                kestod.kill();
-            }
+            end();
         }
         const ledger::Account account = readLedger(kestod);
         EXPECT_GE(account[Counter::Deliveries], answered);
@@ -251,13 +477,13 @@ TEST_P(KilledUnderLoadTest, WhatWasAnsweredIsCountedAndKept)
     EXPECT_GE(kestod.eventCount(), 2 * answered);
 }
 
-INSTANTIATE_TEST_SUITE_P(BySignalOrCall, KilledUnderLoadTest, testing::Bool(),
-                         [](const auto& test) { return test.param ? "ByKillService" : "BySigkill"; });
+INSTANTIATE_TEST_SUITE_P(Ends, EndUnderLoadTest, testing::Values(End::BySigkill, End::ByKillService, End::BySigterm),
+                         [](const auto& test) { return nameOf(test.param); });
 
 TEST_F(FaultsTest, ConnectionsThatComeAndGoAreCounted)
 {
     WireClient client = connect();
-    constexpr std::uint64_t count = 2000;
+    constexpr std::uint64_t count = 10'000;
     for (std::uint64_t number = 0; number < count; ++number)
         WireClient(kestod.socketPath()).ask(Create, 1);
     EXPECT_TRUE(waitUntil([&] {

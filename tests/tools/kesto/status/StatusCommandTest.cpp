@@ -1,6 +1,6 @@
 // What a real service counted, from a shell: while it runs, after it ended, and when there is nothing to read.
 #include "end_to_end/Kestod.h"
-#include "end_to_end/SmallDisk.h"
+#include "end_to_end/Disks.h"
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
 #include "support/AnotherProcess.h"
@@ -156,8 +156,8 @@ TEST_F(StatusCommand, SaysWhoseMessagesWereRefused)
 
 TEST_F(StatusCommand, SaysWhoseEventsWereLostToThoseWhoMayKnow)
 {
-    const end_to_end::SmallDisk disk(kestod.directory() / "state");
-    if (!disk.isMounted())
+    const end_to_end::SmallDisk disk(kestod.directory() / "state", "2m");
+    if (!disk)
         GTEST_SKIP() << "needs the right to mount";
     kestod.startAndAwait();
     letStrangersIn();
@@ -165,7 +165,7 @@ TEST_F(StatusCommand, SaysWhoseEventsWereLostToThoseWhoMayKnow)
     EXPECT_TRUE(end_to_end::waitUntil([&] { return kestod.events("*uptime").size() == 2; })) << "of all clients so far";
     disk.fill();
     overfillAs("recorder");
-    disk.makeRoom();
+    disk.free();
 
     const auto status = json(1);
     const std::uint64_t lostToDisk = status["lost"]["diskFull"].GetUint64();
