@@ -49,6 +49,14 @@ public:
     };
     [[nodiscard]] Rates lastMinute() const;
 
+    // Does the work while nothing is posted, so that it may move the image's bytes to another place behind the same
+    // address. Single counts go on meanwhile.
+    template <typename Work> void withoutPosts(Work work)
+    {
+        const foundation::Lock lock(lock_);
+        work();
+    }
+
     // The ledger calls the handler at the next change, on the thread that makes it, and then not again until it is set
     // again. The handler must not use the ledger.
     void callAtNextChange(std::move_only_function<void()> handler);

@@ -188,6 +188,23 @@ bool LedgerImage::canGoOn() const
     return magic == expectedMagic && paths == pathsOfThisVersion() && newestWhole(slots) == &newest();
 }
 
+void LedgerImage::copyFrom(LedgerImage& other)
+{
+    magic = other.magic;
+    began = other.began;
+    paths = other.paths;
+    slots = other.slots;
+    culprits = other.culprits;
+    for (std::size_t place = 0; place < mostCounters; ++place)
+        live[place] = std::atomic_ref(other.live[place]).load();
+}
+
+void LedgerImage::addCountedSince(const Words& copied, LedgerImage& other)
+{
+    for (std::size_t place = 0; place < mostCounters; ++place)
+        std::atomic_ref(live[place]).fetch_add(std::atomic_ref(other.live[place]).load() - copied[place]);
+}
+
 void LedgerImage::begin(const Account& account)
 {
     *this = {};

@@ -85,6 +85,10 @@ struct LedgerImage {
 
     // Makes it hold the account, and nothing of before.
     void begin(const Account& account);
+    // Makes it hold the same as the other, in which threads may count one by one meanwhile.
+    void copyFrom(LedgerImage& other);
+    // Adds what was counted one by one in the other since `copied` was copied from it, while threads count here.
+    void addCountedSince(const Words& copied, LedgerImage& other);
     // Whether a ledger of this version can go on counting in it.
     [[nodiscard]] bool canGoOn() const;
 

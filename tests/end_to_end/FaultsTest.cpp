@@ -262,6 +262,24 @@ TEST_F(FaultsTest, ALogThatIsRemovedWhileTheServiceRunsCostsNoEvent)
     expectSumsInTime();
 }
 
+TEST_F(FaultsTest, ALedgerThatIsRemovedWhileTheServiceRunsIsMadeAnewWithAllCounts)
+{
+    WireClient client = connect();
+    send(client, 10);
+    const fs::path ledger = kestod.directory() / "state" / "analytics.ledger";
+    fs::remove(ledger);
+    EXPECT_TRUE(waitUntil([&] {
+        send(client, 1);
+        return fs::exists(ledger);
+    }));
+    kestod.kill();
+    EXPECT_GE(counted(Counter::Deliveries), static_cast<std::uint64_t>(sent));
+    kestod.start();
+    expectSumsInTime();
+    EXPECT_EQ(counted(Counter::RemovedByDamage), 0U);
+    EXPECT_EQ(counted(Counter::Recorded), static_cast<std::uint64_t>(sent));
+}
+
 // By the seed of what is overwritten, and whether the service runs meanwhile.
 class OverwrittenPagesTest : public FaultsTest, public testing::WithParamInterface<std::tuple<unsigned, bool>> { };
 

@@ -243,6 +243,21 @@ void overwritePages(Scene& scene)
     scene.isDamaged = true;
 }
 
+// Until the service has made it anew, a kill would lose what was counted.
+void removeLedger(Scene& scene)
+{
+    const fs::path ledger = scene.kestod.directory() / "state" / "analytics.ledger";
+    fs::remove(ledger);
+    WireClient client(scene.kestod.socketPath());
+    client.ask(Create, 1);
+    const bool isBack = waitUntil([&] {
+        client.ask(Validate, 1);
+        return fs::exists(ledger);
+    });
+    if (!isBack)
+        throw std::runtime_error("the service does not make its ledger anew");
+}
+
 template <typename Change> std::function<void(Scene&)> whileStopped(Change change)
 {
     return [change](Scene& scene) {
@@ -293,6 +308,7 @@ Faults allFaults(const Scene& scene)
         {"store replaced while stopped", 1, replaceWhileStopped},
         {"log removed", 1, [](Scene& at) { remove(at, "-wal"); }},
         {"index of the log removed", 1, [](Scene& at) { remove(at, "-shm"); }},
+        {"ledger removed", 1, removeLedger},
         {"store truncated", 1, truncate},
         {"store truncated while stopped", 1, whileStopped(truncate)},
         {"pages overwritten", 1, overwritePages},

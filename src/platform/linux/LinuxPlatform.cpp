@@ -46,8 +46,12 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
     log_.setLedger(ledger_);
     preferences_.setChangeHandler([this](std::string_view domain) { notifications_.post(notificationOf(domain)); });
     // The replies of a turn leave once its events are kept.
-    workQueues_.setTurnEndHandler([this](Turn& turn) { analytics_.endTurn(turn, turn.letters.take()); },
-                                  [this] { return analytics_.isFillingUp(); });
+    workQueues_.setTurnEndHandler(
+        [this](Turn& turn) {
+            ledgerFile_.keepInPlace(ledger_);
+            analytics_.endTurn(turn, turn.letters.take());
+        },
+        [this] { return analytics_.isFillingUp(); });
 }
 
 void LinuxPlatform::finish()
