@@ -6,6 +6,7 @@
 #include <chrono>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <regex>
 #include <sqlite3.h>
 
 namespace kesto_tool {
@@ -354,6 +355,31 @@ TEST_F(EventsCommand, FollowsTheStoreThatTakesThePlaceOfTheOneItReads)
     database->add(1000, "d");
     EXPECT_THAT(follower->waitForOutput("\"d\""), EndsWith(jsonLine(1, "c") + jsonLine(2, "d")));
     EXPECT_EQ(follower->errors(), "");
+}
+
+// There `events` is a view, in which a message is two events.
+TEST_F(EventsCommand, ReadsTheStoreOfARealService)
+{
+    end_to_end::Kestod kestod;
+    kestod.start();
+    end_to_end::WireClient client(kestod.socketPath());
+    for (int number = 1; number <= 2; ++number)
+        client.ask(end_to_end::SendMessage, foundation::Dictionary{{"a", number}}, 4, 1, foundation::Value());
+    const auto read = [&](Tool::Arguments further) {
+        further.insert(further.begin(),
+                       {"events", "--json", "--database", kestod.directory() / "state/analytics.sqlite3"});
+        return std::regex_replace(tool.print(further), std::regex(R"("time":[0-9]{10}[.0-9]*)"), R"("time":0)");
+    };
+    const auto line = [](int id, const std::string& name, int number) {
+        return "{\"id\":" + std::to_string(id) + ",\"time\":0,\"name\":\"com.quarn." + name
+            + "\",\"payload\":{\"a\":" + std::to_string(number) + ",\"HostApplicationDisplayID\":\"Unknown\"}}\n";
+    };
+    const std::string own = "kesto.Playback.Start";
+    const std::string ofService = "standalone.Playback.Start";
+    EXPECT_EQ(read({}), line(1, own, 1) + line(2, ofService, 1) + line(3, own, 2) + line(4, ofService, 2));
+    EXPECT_EQ(read({"--name", "*.standalone.*"}), line(2, ofService, 1) + line(4, ofService, 2));
+    EXPECT_EQ(read({"--count", "1"}), line(4, ofService, 2));
+    EXPECT_EQ(read({"--since", "9999-01-31"}), "");
 }
 
 TEST_F(EventsCommand, FollowsARealService)
