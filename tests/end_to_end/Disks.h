@@ -1,5 +1,5 @@
-// Disks that are small or read-only, in place of the service's state directory or over its database. They need the right
-// to mount, which root has.
+// Disks that are small or read-only, in place of the service's state directory or over its database. They need the
+// right to mount, which root has.
 #pragma once
 
 #include <cerrno>
@@ -67,8 +67,7 @@ public:
     explicit ReadOnlyView(std::filesystem::path place) : Mount(std::move(place))
     {
         isMounted_ = ::mount(place_.c_str(), place_.c_str(), nullptr, MS_BIND, nullptr) == 0;
-        if (isMounted_
-            && ::mount(nullptr, place_.c_str(), nullptr, MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr) != 0)
+        if (isMounted_ && ::mount(nullptr, place_.c_str(), nullptr, MS_REMOUNT | MS_BIND | MS_RDONLY, nullptr) != 0)
             throw std::system_error(errno, std::generic_category(), "mounting read-only");
     }
 };

@@ -70,8 +70,7 @@ const Fault& Rounds::choose()
 {
     const auto add = [](unsigned sum, const Fault& fault) { return sum + fault.weight; };
     unsigned place =
-        static_cast<unsigned>(random_())
-        % std::accumulate(faults_.possible.begin(), faults_.possible.end(), 0U, add);
+        static_cast<unsigned>(random_()) % std::accumulate(faults_.possible.begin(), faults_.possible.end(), 0U, add);
     auto fault = faults_.possible.begin();
     for (; place >= fault->weight; ++fault)
         place -= fault->weight;

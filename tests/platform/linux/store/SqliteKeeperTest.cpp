@@ -1022,9 +1022,9 @@ TEST_F(SqliteKeeperTest, ReadersThatFollowOnEachOtherDoNotKeepTheLogFromBeginnin
         clock.advance(SqliteKeeper::secondsBetweenWaits); // on a busy machine a wait may fail; it is repeated
     }
     EXPECT_EQ(lost(StoreError::LogHeld), 0U);
-    // Half of the limit before it waits, a round, and a step of tidying, which writes up to 2 MB, because it changes many
-    // pages and each has 8 KiB: 4.7 MB. Each wait that fails adds a round.
-    EXPECT_LT(logBytes(), 6 * megabyte);
+    // Usually it has 4.7 MB: half of the limit before the writer waits, a round, and a step of tidying, which writes up
+    // to 2 MB, since it changes many pages of 8 KiB. On a busy machine waits fail, and that step begins at the limit.
+    EXPECT_LT(logBytes(), 7 * megabyte);
 }
 
 TEST_F(SqliteKeeperTest, AProgramThatWritesHoldsUpTheStoreButNotForEver)
