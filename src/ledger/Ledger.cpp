@@ -14,6 +14,7 @@ Ledger::Ledger() : ownImage_(std::make_unique<LedgerImage>()), image_(*ownImage_
 
 Ledger::Ledger(LedgerImage& image) : image_(image)
 {
+    image_.dropUncountedCulprits();
     countsAtStart_ = counts();
     const LargestCulprits known = image_.largestCulprits();
     for (std::size_t charge = 0; charge < chargeCount; ++charge)
@@ -43,10 +44,10 @@ void Ledger::post(const Tally& tally, const std::optional<StoreState>& store)
     {
         const auto now = LastMinute::Clock::now();
         const foundation::Lock lock(lock_);
+        charge(tally.charged());
         image_.add(tally, store);
         deliveries_.add(tally[Counter::Deliveries], now);
         events_.add(tally[Counter::Events], now);
-        charge(tally.charged());
     }
     reportChange();
 }

@@ -5,6 +5,7 @@
 #include <atomic>
 #include <cassert>
 #include <cstring>
+#include <limits>
 #include <string_view>
 #include <type_traits>
 
@@ -45,12 +46,14 @@ std::uint64_t checksumOf(const LedgerImage::CulpritSlot& slot)
     return weightedSum(slot.rows, 1) + slot.sequence * weight(0);
 }
 
-// The whole slot with the higher number; null if none is whole.
-template <typename Slot> const Slot* newestWhole(const std::array<Slot, 2>& slots)
+// The whole slot with the higher number that is not above `last`; null if there is none.
+template <typename Slot>
+const Slot* newestWhole(const std::array<Slot, 2>& slots,
+                        std::uint64_t last = std::numeric_limits<std::uint64_t>::max())
 {
     const Slot* newest = nullptr;
     for (const Slot& slot : slots)
-        if (slot.sequence != 0 && slot.checksum == checksumOf(slot)
+        if (slot.sequence != 0 && slot.sequence <= last && slot.checksum == checksumOf(slot)
             && (newest == nullptr || slot.sequence > newest->sequence))
             newest = &slot;
     return newest;
@@ -58,7 +61,7 @@ template <typename Slot> const Slot* newestWhole(const std::array<Slot, 2>& slot
 
 // The compiler keeps the order of the steps, so a process that is killed between two of them leaves a slot that does
 // not count. `fill` gets the older slot, which still has its old content, and the newer one.
-template <typename Slot, typename Fill> void replaceOlder(std::array<Slot, 2>& slots, Fill fill)
+template <typename Slot, typename Fill> void replaceOlder(std::array<Slot, 2>& slots, std::uint64_t sequence, Fill fill)
 {
     const std::size_t newer = slots[1].sequence > slots[0].sequence ? 1 : 0;
     Slot& slot = slots[1 - newer];
@@ -66,7 +69,7 @@ template <typename Slot, typename Fill> void replaceOlder(std::array<Slot, 2>& s
     std::atomic_signal_fence(std::memory_order_seq_cst);
     fill(slot, slots[newer]);
     std::atomic_signal_fence(std::memory_order_seq_cst);
-    slot.sequence = slots[newer].sequence + 1;
+    slot.sequence = sequence;
 }
 
 template <std::size_t size> void putText(std::string_view text, std::array<char, size>& out)
@@ -142,7 +145,7 @@ std::uint64_t Account::sum(Charge charge) const noexcept
 
 void LedgerImage::add(const Tally& tally, const std::optional<StoreState>& state)
 {
-    replaceOlder(slots, [&](Slot& slot, const Slot& newest) {
+    replaceOlder(slots, newest().sequence + 1, [&](Slot& slot, const Slot& newest) {
         slot.counts = newest.counts;
         slot.store = state.value_or(newest.store);
         std::uint64_t change = 0;
@@ -158,16 +161,24 @@ void LedgerImage::add(const Tally& tally, const std::optional<StoreState>& state
 
 void LedgerImage::replaceCulprits(const LargestCulprits& largest)
 {
-    replaceOlder(culprits, [&](CulpritSlot& slot, const CulpritSlot& newest) {
+    const std::uint64_t sequence = newest().sequence + 1;
+    replaceOlder(culprits, sequence, [&](CulpritSlot& slot, const CulpritSlot&) {
         fill(slot, largest);
-        slot.checksum = weightedSum(slot.rows, 1) + (newest.sequence + 1) * weight(0);
+        slot.checksum = weightedSum(slot.rows, 1) + sequence * weight(0);
     });
+}
+
+void LedgerImage::dropUncountedCulprits()
+{
+    for (CulpritSlot& slot : culprits)
+        if (slot.sequence > newest().sequence)
+            slot.sequence = 0;
 }
 
 LargestCulprits LedgerImage::largestCulprits() const
 {
-    const CulpritSlot* newest = newestWhole(culprits);
-    return newest == nullptr ? LargestCulprits() : read(*newest);
+    const CulpritSlot* counting = newestWhole(culprits, newest().sequence);
+    return counting == nullptr ? LargestCulprits() : read(*counting);
 }
 
 std::optional<Account> accountIn(const LedgerImage& image)

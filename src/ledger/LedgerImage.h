@@ -71,7 +71,7 @@ struct LedgerImage {
         std::array<char, 128> application;
     };
     struct CulpritSlot {
-        std::uint64_t sequence;
+        std::uint64_t sequence; // of the slot of counts from which on they count
         std::uint64_t checksum;
         std::array<std::array<CulpritRow, culpritsKept>, chargeCount> rows;
     };
@@ -97,7 +97,10 @@ struct LedgerImage {
     // Adds to the counts, and replaces the state of the store if there is one. One thread at a time.
     void add(const Tally& tally, const std::optional<StoreState>& store);
     [[nodiscard]] LargestCulprits largestCulprits() const;
+    // They count together with what is added next.
     void replaceCulprits(const LargestCulprits& largest);
+    // Forgets culprits of something that was never added, because the process was killed before.
+    void dropUncountedCulprits();
 };
 
 // What stands in an image, which may be of another version: counts that this version does not know are left out.

@@ -143,8 +143,33 @@ TEST_F(LedgerImageTest, ReplacesTheCulprits)
         LargestCulprits largest;
         largest[1].push_back({{.user = 1, .process = "a", .application = ""}, count});
         image().replaceCulprits(largest);
+        add(Counter::LostToDiskFull, 1);
     }
     EXPECT_THAT(accountIn(image())->culprits[1], ElementsAre(Field(&CulpritCount::count, 3U)));
+}
+
+// A kill may come between the two.
+TEST_F(LedgerImageTest, CulpritsCountTogetherWithWhatIsAddedNext)
+{
+    const auto replaceBy = [this](std::uint64_t count) {
+        image().replaceCulprits({{{}, {{{.user = 7, .process = "player", .application = ""}, count}}, {}}});
+    };
+    const auto lost = [this] {
+        const auto largest = accountIn(image()).value().culprits[1];
+        return largest.empty() ? 0 : largest[0].count;
+    };
+    replaceBy(3);
+    EXPECT_EQ(lost(), 0U);
+    add(Counter::LostToDiskFull, 3);
+    EXPECT_EQ(lost(), 3U);
+    replaceBy(5);
+    EXPECT_EQ(lost(), 3U);
+    image().dropUncountedCulprits();
+    add(Counter::Recorded, 1);
+    EXPECT_EQ(lost(), 3U);
+    replaceBy(7);
+    add(Counter::LostToDiskFull, 4);
+    EXPECT_EQ(lost(), 7U);
 }
 
 TEST_F(LedgerImageTest, ACounterFitsIntoItsRoom)

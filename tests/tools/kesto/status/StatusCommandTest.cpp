@@ -1,6 +1,6 @@
 // What a real service counted, from a shell: while it runs, after it ended, and when there is nothing to read.
-#include "end_to_end/Kestod.h"
 #include "end_to_end/Disks.h"
+#include "end_to_end/Kestod.h"
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
 #include "support/AnotherProcess.h"
