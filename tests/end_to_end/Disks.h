@@ -2,6 +2,8 @@
 // right to mount, which root has.
 #pragma once
 
+#include "platform/linux/files/FileDescriptor.h"
+
 #include <cerrno>
 #include <fcntl.h>
 #include <filesystem>
@@ -39,26 +41,27 @@ public:
     SmallDisk(std::filesystem::path place, const std::string& size) : Mount(std::move(place))
     {
         isMounted_ = ::mount("none", place_.c_str(), "tmpfs", 0, ("size=" + size).c_str()) == 0;
+        if (isMounted_)
+            ballast_ = platform::FileDescriptor(::open(place_.c_str(), O_TMPFILE | O_RDWR | O_CLOEXEC, 0600));
     }
 
     // Leaves no room at all.
     void fill() const
     {
-        const int file = ::open(ballast().c_str(), O_WRONLY | O_CREAT | O_CLOEXEC, 0600);
         off_t size = 0;
         for (off_t step = 1 << 20; step >= 4096; step /= 2)
-            while (::posix_fallocate(file, size, step) == 0)
+            while (::posix_fallocate(ballast_.get(), size, step) == 0)
                 size += step;
-        ::close(file);
     }
+    // Also in a process that was forked, whatever its rights.
     void free() const
     {
-        std::error_code error;
-        std::filesystem::remove(ballast(), error);
+        if (::ftruncate(ballast_.get(), 0) != 0)
+            throw std::system_error(errno, std::generic_category(), "making room");
     }
 
 private:
-    [[nodiscard]] std::filesystem::path ballast() const { return place_ / "ballast"; }
+    platform::FileDescriptor ballast_;
 };
 
 // The same file or directory, without the right to write to it. Programs that have it open are not hindered.

@@ -272,9 +272,10 @@ template <typename Change> std::function<void(Scene&)> whileStopped(Change chang
 void changeConfiguration(Scene& scene)
 {
     const char* used = scene.random() % 2 == 0 ? "com.quarn.*" : "com.quarn.kesto.*";
-    const std::string megabytes = std::to_string(1 + upTo(scene, 64));
+    const unsigned megabytes = 1 + upTo(scene, mostMegabytes - 1);
     support::replaceFile(scene.kestod.directory() / "configuration" / "analytics.toml",
-                         "used = [\"" + std::string(used) + "\"]\nmaximum_size_mb = " + megabytes + "\n");
+                         "used = [\"" + std::string(used) + "\"]\nmaximum_size_mb = " + std::to_string(megabytes)
+                             + "\n");
 }
 
 void setClock(Scene& scene)

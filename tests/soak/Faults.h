@@ -22,6 +22,9 @@ struct Scene {
     bool isDamaged = false; // the store, since this was last set to false
 };
 
+// Of the store, in the configuration: with several that were set aside, it must fit on the disk.
+inline constexpr unsigned mostMegabytes = 16;
+
 struct Fault {
     std::string_view name;
     unsigned weight; // how often it comes, beside the others

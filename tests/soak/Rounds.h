@@ -46,7 +46,8 @@ private:
     [[nodiscard]] std::vector<std::string> problems() const;
 
     const Options options_;
-    end_to_end::Kestod kestod_{{}, {{"KESTO_LOG", "error"}}};
+    end_to_end::Kestod kestod_{{{"analytics.toml", "maximum_size_mb = " + std::to_string(mostMegabytes) + "\n"}},
+                               {{"KESTO_LOG", "error"}}};
     const end_to_end::SmallDisk disk_;
     Random random_; // chooses; each fault has numbers of its own, so that their choice depends on nothing else
     Scene scene_;

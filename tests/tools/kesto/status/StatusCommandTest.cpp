@@ -65,7 +65,8 @@ protected:
         client.ask(end_to_end::SendMessage, Dictionary{{"a", std::nan("")}}, 4, 1, Array{1});
     }
     // Another user's process of that name sends more than a full disk takes.
-    void overfillAs(const char* name) const
+    // There is room again before it goes, so that no event of its end is lost.
+    void overfillAs(const char* name, const end_to_end::SmallDisk& disk) const
     {
         support::runInAnotherProcess([&] {
             ASSERT_EQ(::setgid(stranger), 0);
@@ -79,6 +80,7 @@ protected:
             for (int number = 0; number < 100; ++number)
                 client.ask(end_to_end::SendMessage, Dictionary{{"n", number}, {"text", std::string(4000, 'x')}}, 4, 1,
                            Array{2});
+            disk.free();
         });
     }
     void letStrangersIn() const
@@ -164,8 +166,7 @@ TEST_F(StatusCommand, SaysWhoseEventsWereLostToThoseWhoMayKnow)
     loseAnEvent();
     EXPECT_TRUE(end_to_end::waitUntil([&] { return kestod.events("*uptime").size() == 2; })) << "of all clients so far";
     disk.fill();
-    overfillAs("recorder");
-    disk.free();
+    overfillAs("recorder", disk);
 
     const auto status = json(1);
     const std::uint64_t lostToDisk = status["lost"]["diskFull"].GetUint64();
