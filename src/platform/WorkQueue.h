@@ -48,8 +48,8 @@ public:
 
 class Lane;
 
-// A serial queue that works in turns: it runs what waits, but not for long, and then hands what the items gathered to the
-// platform, as a whole. Each item gets the turn that it runs in; items that gather nothing go without.
+// A serial queue that works in turns: it runs what waits, but not for long, and then hands what the items gathered to
+// the platform, as a whole. Each item gets the turn that it runs in; items that gather nothing go without.
 class TurnQueue : public WorkQueue {
 public:
     using WorkQueue::submit;

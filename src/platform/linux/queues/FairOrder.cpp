@@ -57,6 +57,13 @@ template <typename Contest> void chargeFirst(Contest& contest, FairOrder::Durati
 
 } // namespace
 
+// A lane that waits and its user own each other.
+FairOrder::~FairOrder()
+{
+    for (const auto& [used, user] : contest_)
+        user->lanes.clear();
+}
+
 std::shared_ptr<FairOrder::Lane> FairOrder::makeLane(std::uint32_t user)
 {
     std::erase_if(users_, [](const auto& known) { return known.second.expired(); });

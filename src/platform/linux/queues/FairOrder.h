@@ -24,6 +24,11 @@ class FairOrder {
 public:
     using Duration = std::chrono::nanoseconds;
 
+    FairOrder() = default;
+    ~FairOrder();
+    FairOrder(const FairOrder&) = delete;
+    FairOrder& operator=(const FairOrder&) = delete;
+
     struct Item {
         TurnItem run;
         bool mayTakeLong = false;

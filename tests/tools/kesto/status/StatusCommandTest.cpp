@@ -12,9 +12,11 @@
 #include <fstream>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <map>
 #include <rapidjson/document.h>
 #include <sys/prctl.h>
 #include <unistd.h>
+#include <utility>
 
 namespace kesto_tool {
 namespace {
@@ -24,6 +26,7 @@ using foundation::Array;
 using foundation::Dictionary;
 using testing::HasSubstr;
 using testing::MatchesRegex;
+using testing::Pair;
 using testing::StartsWith;
 
 class StatusCommand : public testing::Test {
@@ -174,14 +177,13 @@ TEST_F(StatusCommand, SaysWhoseEventsWereLostToThoseWhoMayKnow)
     EXPECT_EQ(status["lost"]["notJson"].GetUint64(), 2U);
     EXPECT_EQ(end_to_end::readLedger(kestod).sum(ledger::Charge::Lost), lostToDisk + 2);
     const auto& lost = status["who"]["lost"];
-    ASSERT_EQ(lost.Size(), 2U) << "and no rest";
-    EXPECT_EQ(lost[0]["user"].GetUint(), stranger);
-    EXPECT_STREQ(lost[0]["process"].GetString(), "recorder");
     EXPECT_STREQ(lost[0]["application"].GetString(), "org.example.a");
-    EXPECT_EQ(lost[0]["count"].GetUint64(), lostToDisk);
-    EXPECT_EQ(lost[1]["user"].GetUint(), ::geteuid());
-    EXPECT_STREQ(lost[1]["process"].GetString(), "kesto_tool_test");
-    EXPECT_EQ(lost[1]["count"].GetUint64(), 2U);
+    std::map<std::pair<unsigned, std::string>, std::uint64_t> byProcess; // its end may cost the recorder an event, too
+    for (const auto& culprit : lost.GetArray())
+        byProcess[{culprit["user"].GetUint(), culprit["process"].GetString()}] += culprit["count"].GetUint64();
+    EXPECT_THAT(byProcess,
+                testing::UnorderedElementsAre(Pair(Pair(stranger, "recorder"), lostToDisk),
+                                              Pair(Pair(::geteuid(), "kesto_tool_test"), 2U)));
 
     tool.giveUpRights();
     EXPECT_FALSE(json(1).HasMember("who"));
