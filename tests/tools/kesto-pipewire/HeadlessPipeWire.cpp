@@ -89,9 +89,9 @@ Program::Program(const std::vector<std::string>& arguments, const Environment& e
 
 Program::~Program()
 {
+    kill(SIGCONT); // first: a program that ends is stopped by its leak check, which would never see it stop
     closeInput();
     kill(SIGTERM);
-    kill(SIGCONT);
     wait();
     ::close(output_);
 }
