@@ -1,5 +1,5 @@
-// What floods are set against: the waits of a client of a service that nobody floods, alone and beside processes that
-// only burn processor time, and those of a client of dbus-daemon beside clients that flood it.
+// The waits that floods are compared with: those of a client of a service without a flood, alone and beside processes
+// that only burn processor time, and those of a client of dbus-daemon beside clients that flood it.
 #pragma once
 
 #include "support/Harness.h"

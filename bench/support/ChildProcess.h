@@ -30,7 +30,7 @@ public:
 
     [[nodiscard]] pid_t identifier() const { return identifier_; }
     [[nodiscard]] bool hasEnded() const;
-    // Ends it immediately, whatever it does; the destructor gives it time to end by itself.
+    // Kills the process with SIGKILL. The destructor asks with SIGTERM first.
     void kill();
 
 private:

@@ -29,7 +29,7 @@ public:
 
     [[nodiscard]] pid_t identifier() const { return process_.identifier(); }
     [[nodiscard]] std::filesystem::path socketPath() const;
-    // Ends the service immediately, whatever it does.
+    // Kills the service with SIGKILL.
     void kill() { process_.kill(); }
     // Lets programs of other users reach the socket.
     void admitOtherUsers() const;

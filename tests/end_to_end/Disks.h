@@ -53,7 +53,7 @@ public:
             while (::posix_fallocate(ballast_.get(), size, step) == 0)
                 size += step;
     }
-    // Also in a process that was forked, whatever its rights.
+    // Works without rights, too: the file is open already, also in a forked process.
     void free() const
     {
         if (::ftruncate(ballast_.get(), 0) != 0)

@@ -181,7 +181,7 @@ TEST(Report, SumsUpTheCulpritsBeyondTheTenLargest)
     Ledger ledger;
     for (std::uint32_t user = 1; user <= 12; ++user)
         ledger.count(Counter::LostToDiskFull, {.user = user, .process = "player", .application = ""}, 100 + user);
-    ledger.count(Counter::LostToReadOnly, 5); // by nobody known
+    ledger.count(Counter::LostToReadOnly, 5); // without a culprit
     const Array lost = *at(report(ledger, process, true), "who.lost").array();
     ASSERT_EQ(lost.size(), 11U);
     EXPECT_EQ(lost[0].text(), R"({"user":12,"process":"player","application":"","count":112})");

@@ -24,7 +24,7 @@ struct Options {
 // One thread.
 class Rounds {
 public:
-    // Starts the service. Throws if there is no fault of a name in `without`.
+    // Starts the service. Throws std::invalid_argument if `without` names an unknown fault.
     explicit Rounds(const Options& options);
 
     // The faults that this system or this user cannot cause.

@@ -66,6 +66,16 @@ protected:
         keep(count);
         close();
     }
+    // Leaves a database that was damaged with so many events, and of which a part was saved.
+    void beginToSave(std::size_t events)
+    {
+        keepAndClose(events);
+        support::overwrite(file, 0, std::string(pageSize, 'x'));
+        SqliteKeeper keeper(directory.path(), clock, ProviderLog(log));
+        ledger::Tally tally;
+        keeper.open();
+        ASSERT_TRUE(keeper.tidy(true, tally));
+    }
     void keepAndSettle(std::size_t count)
     {
         keep(count);
@@ -603,14 +613,7 @@ class UnfinishedSavingTest : public StoreDamageTest, public testing::WithParamIn
 
 TEST_P(UnfinishedSavingTest, CountsWhatItHas)
 {
-    keepAndClose(10'000);
-    support::overwrite(file, 0, std::string(pageSize, 'x'));
-    {
-        SqliteKeeper keeper(directory.path(), clock, ProviderLog(log));
-        ledger::Tally tally;
-        keeper.open();
-        ASSERT_TRUE(keeper.tidy(true, tally));
-    }
+    beginToSave(10'000);
     for (const std::string& mark : filesNamed("-unsaved")) // by hand, or because the database is an old copy
         fs::remove(directory / mark);
     if (GetParam())
@@ -643,14 +646,7 @@ TEST_F(StoreDamageTest, NewEventsAreKeptBeforeTheOldOnesAreSaved)
 
 TEST_F(StoreDamageTest, ADatabaseThatIsDamagedWhileItIsSavedIntoIsSavedToo)
 {
-    keepAndClose(20'000);
-    support::overwrite(file, 0, std::string(pageSize, 'x'));
-    {
-        SqliteKeeper keeper(directory.path(), clock, ProviderLog(log));
-        ledger::Tally tally;
-        keeper.open();
-        EXPECT_TRUE(keeper.tidy(true, tally));
-    }
+    beginToSave(20'000);
     support::overwrite(file, 0, std::string(pageSize, 'y'));
     keep(1, "com.quarn.after");
     settle();
