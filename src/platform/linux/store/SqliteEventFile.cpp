@@ -29,7 +29,8 @@ SqliteEventFile::open(const std::filesystem::path& path, const Clock& clock, Kno
     std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path, clock, origins));
     for (const auto step :
          {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::makeSchema,
-          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::beginRun})
+          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::compareCounts,
+          &SqliteEventFile::beginRun})
         if (const auto done = (*database.*step)(); !done)
             return std::unexpected(done.error());
     return database;
@@ -118,6 +119,17 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
             return corruptIfOther(prepared.error());
         *statement = std::move(*prepared);
     }
+    return {};
+}
+
+// The ledger believes the counts, so they must not wait for the first event to contradict them.
+SqliteEventFile::Expected<> SqliteEventFile::compareCounts()
+{
+    const auto last = connection_->number("SELECT coalesce(max(id), 0) FROM messages");
+    if (!last)
+        return std::unexpected(last.error());
+    if (*last >= counts_.counts().nextEvent)
+        return std::unexpected(StoreError::Corrupt);
     return {};
 }
 

@@ -109,6 +109,7 @@ private:
     [[nodiscard]] Expected<> makeSchema();
     [[nodiscard]] Expected<> configure();
     [[nodiscard]] Expected<> prepareStatements();
+    [[nodiscard]] Expected<> compareCounts();
     [[nodiscard]] Expected<> beginRun();
     [[nodiscard]] Expected<> keepTime();
     [[nodiscard]] Expected<> markFirstEdition(std::int64_t id, double time);

@@ -437,6 +437,18 @@ TEST_F(StoreDamageTest, ADatabaseWhoseRowsContradictEachOtherIsDamaged)
     EXPECT_EQ(storedEvents("com.quarn.after"), 20);
 }
 
+TEST_F(StoreDamageTest, CountsThatTheRowsContradictAreNotBelievedBeforeTheFirstEventEither)
+{
+    keepAndClose(1000);
+    support::Writer(file).execute("UPDATE store SET next_event = 990, kept = 989");
+    store();
+    waitFor([this] { return !filesNamed(".corrupt-").empty(); });
+    settle();
+    EXPECT_EQ(ledger.account()[Counter::Kept], 1000U);
+    EXPECT_EQ(ledger.account()[Counter::RemovedByDamage], 0U);
+    expectSumsToHold("contradiction");
+}
+
 TEST_F(StoreDamageTest, EventsOfTheFirstEditionAreSavedAndMoved)
 {
     {
