@@ -207,9 +207,9 @@ private:
 
     const support::TemporaryDirectory directory_;
     const std::filesystem::path path_ = directory_ / "socket";
+    ledger::Ledger ledger_; // the end of a turn still counts what it cannot send
     platform::LinuxWorkQueues queues_;
     std::shared_ptr<platform::TurnQueue> queue_;
-    ledger::Ledger ledger_;
     std::unique_ptr<platform::LinuxConnectionListener> listener_;
     std::thread thread_;
 };
