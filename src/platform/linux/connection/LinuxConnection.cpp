@@ -6,6 +6,7 @@
 #include "platform/linux/connection/TrustedPeer.h"
 #include "platform/linux/files/SystemError.h"
 
+#include <algorithm>
 #include <cassert>
 #include <cerrno>
 #include <fmt/format.h>
@@ -91,14 +92,14 @@ void LinuxConnection::resume()
     assert(hub_->isConnectionThread());
     const foundation::Lock lock(lock_);
     epoll_event event = {};
-    event.events = watchedEvents_ = EPOLLIN | EPOLLRDHUP;
+    event.events = watchedEvents_ = EPOLLIN | EPOLLRDHUP | EPOLLET;
     event.data.ptr = this;
     isResumed_ = ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_ADD, socket_.get(), &event) == 0;
     if (!isResumed_)
         breakReason_.emplace(systemErrorText(errno));
 }
 
-bool LinuxConnection::handle(std::uint32_t events)
+LinuxConnection::Next LinuxConnection::handle(std::uint32_t events, std::size_t mostBytes)
 {
     assert(hub_->isConnectionThread());
     constexpr std::uint32_t endings = EPOLLHUP | EPOLLRDHUP | EPOLLERR;
@@ -106,43 +107,53 @@ bool LinuxConnection::handle(std::uint32_t events)
         const foundation::Lock lock(lock_);
         writeOutput();
     }
-    if ((events & ~EPOLLOUT) != 0 && ((events & endings) == 0 || !isBrokenOff()))
-        read();
+    if ((events & ~EPOLLOUT) != 0)
+        mayHaveUnread_ = true;
+    if ((events & endings) != 0)
+        peerIsGone_ = true;
+    if (mayHaveUnread_ && mayRead())
+        read(mostBytes);
     answerStatusRequest();
     return settle();
 }
 
-bool LinuxConnection::isBrokenOff()
+// It also reads from a client that is behind but gone: the bytes left in the socket are limited, and only behind them
+// does the connection find its end.
+bool LinuxConnection::mayRead()
 {
     const foundation::Lock lock(lock_);
-    return breakReason_.has_value();
+    return !breakReason_ && (peerIsGone_ || (watchedEvents_ & EPOLLIN) != 0);
 }
 
 // Ends the connection if it broke or the peer closed it; otherwise watches for what comes next. Call it after
-// everything that can break the connection. Whether the connection goes on.
-bool LinuxConnection::settle()
+// everything that can break the connection.
+LinuxConnection::Next LinuxConnection::settle()
 {
     std::optional<std::string> reason;
     {
         const foundation::Lock lock(lock_);
         if (isOver_)
-            return false;
+            return Next::End;
         if (!breakReason_ && !peerIsDone_) {
             watch();
-            return true;
+            const bool reads = mayHaveUnread_ && (peerIsGone_ || (watchedEvents_ & EPOLLIN) != 0);
+            const bool answers = !statusRequests_.empty() && output_.empty();
+            return reads || answers ? Next::Turn : Next::Event;
         }
         reason = breakReason_; // it counts even if the peer closed at the same moment
     }
     end(std::move(reason));
-    return false;
+    return Next::End;
 }
 
-// Reads once, so that every client gets its turn. It also reads from a client that is behind but gone: the bytes left
-// in the socket are limited, and only behind them does the connection find its end.
-void LinuxConnection::read()
+// A read that fills less than the buffer has emptied the socket. A client that sends more than bytes can cut a read
+// short; the rest is then read with what it sends next, or at its end.
+void LinuxConnection::read(std::size_t mostBytes)
 {
     auto& buffer = hub_->readBuffer;
-    const ssize_t count = ::recv(socket_.get(), buffer.data(), buffer.size(), MSG_DONTWAIT);
+    const std::size_t room = std::min(mostBytes, buffer.size());
+    const ssize_t count = ::recv(socket_.get(), buffer.data(), room, MSG_DONTWAIT);
+    mayHaveUnread_ = count > 0 && (peerIsGone_ || static_cast<std::size_t>(count) == room);
     if (count > 0)
         takeIn({buffer.data(), static_cast<std::size_t>(count)});
     else if (count == 0)
@@ -157,8 +168,8 @@ void LinuxConnection::finish()
     assert(hub_->isConnectionThread());
     isFinishing_ = true;
     ::shutdown(socket_.get(), SHUT_RD);
-    while (settle())
-        read();
+    while (settle() != Next::End)
+        read(ConnectionHub::mostReadAtOnce);
 }
 
 void LinuxConnection::endOfStream()
@@ -395,7 +406,7 @@ void LinuxConnection::watch()
         return;
     const bool behind = isBehind();
     epoll_event event = {};
-    event.events = EPOLLRDHUP;
+    event.events = EPOLLRDHUP | EPOLLET;
     if (!behind && !isLaneFull_)
         event.events |= EPOLLIN;
     if (!output_.empty() || !statusRequests_.empty())

@@ -1,8 +1,8 @@
 // A connection to one client over a Unix stream socket.
 //
-// The connection thread reads: it takes what has come in, up to a buffer that all connections share, cuts it into
-// frames, decodes them, and delivers their calls immediately. Any thread writes: it tries the socket itself. Only what
-// a slow peer does not take waits until the connection thread finds room in the socket again.
+// The connection thread reads: it takes what has come in, up to a limit, into a buffer that all connections share, cuts
+// it into frames, decodes them, and delivers their calls immediately. Any thread writes: it tries the socket itself.
+// Only what a slow peer does not take waits until the connection thread finds room in the socket again.
 //
 // A client may ask for the status as often as it likes: a connection makes one answer in each pass of the connection
 // thread, and only when the socket has taken the one before. The other requests wait; they count as unanswered calls.
@@ -66,9 +66,15 @@ public:
     void send(Turn& turn, std::string frame) override;
     void write(std::string frames) override;
 
-    // Handles events of the socket (those of epoll). False if the connection is over, so that the listener forgets it.
-    // Connection thread.
-    [[nodiscard]] bool handle(std::uint32_t events);
+    // What a connection waits for.
+    enum class Next : std::uint8_t {
+        Event, // of its socket
+        Turn, // of the connection thread: it has more to do already
+        End // nothing: it is over, so that the listener forgets it
+    };
+    // Handles events of the socket (those of epoll, once for each change), and what earlier calls left to do. Reads at
+    // most so many bytes. Connection thread.
+    [[nodiscard]] Next handle(std::uint32_t events, std::size_t mostBytes);
 
     // Ends the connection, with its handlers. Connection thread.
     void invalidate() { end(std::nullopt); }
@@ -83,9 +89,9 @@ private:
         std::size_t size; // of its frame
     };
 
-    [[nodiscard]] bool isBrokenOff();
-    [[nodiscard]] bool settle();
-    void read();
+    [[nodiscard]] bool mayRead();
+    [[nodiscard]] Next settle();
+    void read(std::size_t mostBytes);
     void endOfStream();
     void takeIn(std::string_view bytes);
     [[nodiscard]] std::expected<void, Violation> decodeFrames();
@@ -114,7 +120,9 @@ private:
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;
     ConnectionInput input_;
-    bool peerIsDone_ = false; // it closed its side between two frames
+    bool mayHaveUnread_ = false; // bytes in the socket
+    bool peerIsGone_ = false; // it sends no more, or cannot be reached
+    bool peerIsDone_ = false; // all that it sent is read, and ends between two frames
     bool isFinishing_ = false; // by the service: a frame that is cut short is not the peer's fault
     bool hasAskedForEmitterAccess_ = false;
     bool awaitsStatus_ = false; // a request waits, so that other connections need no lock to find none

@@ -19,8 +19,13 @@
 namespace platform {
 namespace {
 
-constexpr int mostAcceptedAtOnce = 16; // so that connected clients get their turn
+constexpr int mostAcceptedAtOnce = 4; // so that connected clients get their turn
 constexpr std::size_t mostEventsAtOnce = 64;
+
+// While several clients have something to read, the thread reads for so long before it helps and looks who else has
+// come; and so much of one client at once that this takes about that time.
+constexpr std::chrono::microseconds longestReading{25};
+constexpr std::size_t leastRead = 256;
 
 std::size_t mostConnections()
 {
@@ -78,8 +83,8 @@ void LinuxConnectionListener::resume()
     serve();
     if (stoppedHandler_)
         stoppedHandler_();
-    for (const auto& [identity, connection] : std::exchange(connections_, {}))
-        connection->finish();
+    for (const auto& [identity, reader] : std::exchange(connections_, {}))
+        reader->connection->finish();
 }
 
 // When this thread has read everything, it helps with the calls of the clients, if they are few.
@@ -89,11 +94,13 @@ void LinuxConnectionListener::serve()
     ThreadHeap heap([this] { wake(); });
     while (!isStopping_) {
         std::array<epoll_event, mostEventsAtOnce> events;
-        const int count = ::epoll_wait(hub_->epoll.get(), events.data(), events.size(), waitingTime());
+        const int count =
+            ::epoll_wait(hub_->epoll.get(), events.data(), events.size(), ready_.isEmpty() ? waitingTime() : 0);
         for (int index = 0; index < count; ++index)
             handle(events[static_cast<std::size_t>(index)]);
         if (acceptAgainAt_ && *acceptAgainAt_ <= Clock::now())
             resumeAccepting();
+        serveReaders();
         helper.help();
         heap.tidyIfAsked();
     }
@@ -121,19 +128,47 @@ int LinuxConnectionListener::waitingTime() const
 
 void LinuxConnectionListener::handle(const epoll_event& event)
 {
-    if (event.data.ptr == &socket_)
+    if (event.data.ptr == &socket_) {
         acceptWaiting();
-    else if (event.data.ptr != &wake_) // `wake_` itself needs no handling
-        handle(*static_cast<LinuxConnection*>(event.data.ptr), event.events);
+    } else if (event.data.ptr != &wake_) { // `wake_` itself needs no handling
+        const auto& reader = connections_.at(event.data.ptr);
+        reader->events |= event.events;
+        ready_.enter(reader);
+    }
 }
 
-void LinuxConnectionListener::handle(LinuxConnection& connection, std::uint32_t events)
+// Those that want little are all served at once.
+void LinuxConnectionListener::serveReaders()
 {
-    if (connection.handle(events))
-        return;
-    forget(connection);
-    if (!isAccepting_)
-        resumeAccepting();
+    for (auto begin = Clock::now(), now = begin; !ready_.isEmpty() && now - begin < longestReading;) {
+        auto& reader = static_cast<Reader&>(ready_.serveFirst());
+        const bool hasMore = serve(reader, ready_.isContested() ? reader.mostBytes : ConnectionHub::mostReadAtOnce);
+        const auto time = Clock::now() - now;
+        reader.adapt(time);
+        ready_.charge(time, hasMore);
+        now += time;
+    }
+}
+
+void LinuxConnectionListener::Reader::adapt(Clock::duration time)
+{
+    if (time > longestReading)
+        mostBytes = std::max(mostBytes / 2, leastRead);
+    else if (time < longestReading / 2)
+        mostBytes = std::min(mostBytes * 2, ConnectionHub::mostReadAtOnce);
+}
+
+// Whether the connection has more to do already.
+bool LinuxConnectionListener::serve(Reader& reader, std::size_t mostBytes)
+{
+    using enum LinuxConnection::Next;
+    const auto next = reader.connection->handle(std::exchange(reader.events, 0), mostBytes);
+    if (next == End) {
+        forget(*reader.connection);
+        if (!isAccepting_)
+            resumeAccepting();
+    }
+    return next == Turn;
 }
 
 void LinuxConnectionListener::acceptWaiting()
@@ -170,11 +205,14 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     ++user.connections;
     const auto connection =
         std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid, peer.gid});
-    connections_.emplace(connection.get(), connection);
+    const auto reader = std::make_shared<Reader>();
+    reader->connection = connection;
+    ready_.admit(*reader, peer.uid);
+    connections_.emplace(connection.get(), reader);
     hub_->ledger.count(ledger::Counter::ConnectionsAccepted);
     if (!delegate_->shouldAcceptNewConnection(*this, connection))
         connection->invalidate();
-    handle(*connection, 0); // it may be over already
+    ready_.enter(reader); // it may be over already
 }
 
 void LinuxConnectionListener::forget(const LinuxConnection& connection)

@@ -11,11 +11,15 @@
 //
 // When the thread has read what came in, it helps with the resulting work (see SerialQueue). It reads nothing
 // meanwhile, so clients wait; they would wait for the same work anyway.
+//
+// While several clients have something to read, they share the thread's time (see FairShares): it reads a little from
+// one, helps with that, and looks who else has come.
 #pragma once
 
 #include "platform/linux/connection/ConnectionHub.h"
 #include "platform/linux/connection/LinuxConnection.h"
 #include "platform/linux/connection/ListeningSocket.h"
+#include "platform/linux/queues/FairShares.h"
 
 #include <chrono>
 #include <expected>
@@ -70,6 +74,15 @@ private:
         bool refusalIsLogged = false; // since one of the connections ended
     };
 
+    // A connection whose socket has something for it.
+    struct Reader : FairShares::Share {
+        std::shared_ptr<LinuxConnection> connection;
+        std::uint32_t events = 0; // that it has not handled yet
+        std::size_t mostBytes = 4096; // that are read at once while others wait
+
+        void adapt(Clock::duration time);
+    };
+
     LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake, ledger::Ledger& ledger,
                             LogCategory& log);
 
@@ -78,10 +91,11 @@ private:
     void wake();
     [[nodiscard]] int waitingTime() const;
     void handle(const epoll_event& event);
+    void serveReaders();
+    [[nodiscard]] bool serve(Reader& reader, std::size_t mostBytes);
     void acceptWaiting();
     void welcome(FileDescriptor socket);
     void forget(const LinuxConnection& connection);
-    void handle(LinuxConnection& connection, std::uint32_t events);
     void pauseAccepting(std::optional<Clock::duration> pause, int error);
     void resumeAccepting();
 
@@ -96,7 +110,8 @@ private:
     std::atomic<bool> isStopping_ = false;
 
     // Only for the connection thread.
-    std::unordered_map<const LinuxConnection*, std::shared_ptr<LinuxConnection>> connections_;
+    std::unordered_map<const void*, std::shared_ptr<Reader>> connections_; // by connection
+    FairShares ready_; // readers
     std::unordered_map<std::uint32_t, User> users_; // by number
     bool isAccepting_ = false;
     bool pauseIsLogged_ = false;

@@ -1,19 +1,15 @@
 // The order in which the items of many lanes run, so that no lane and no user waits for the work of others.
 //
-// A lane is a sequence of items, such as the calls of one client; it belongs to a user. The next items are those of the
-// user whose items have taken the least time so far, and among the user's lanes those of the lane that took the least:
-// start-time fair queueing (P. Goyal, H. M. Vin, H. Cheng, 1996) at two levels. A lane or user that had nothing to run
-// goes on where the others are now: a pause earns no time to be used at once later, and costs none.
+// A lane is a sequence of items, such as the calls of one client. The time of those that run decides whose are next
+// (see FairShares).
 #pragma once
 
 #include "platform/WorkQueue.h"
+#include "platform/linux/queues/FairShares.h"
 
-#include <chrono>
 #include <cstddef>
 #include <cstdint>
-#include <deque>
 #include <functional>
-#include <map>
 #include <memory>
 #include <vector>
 
@@ -22,18 +18,12 @@ namespace platform {
 // One thread at a time.
 class FairOrder {
 public:
-    using Duration = std::chrono::nanoseconds;
-
-    FairOrder() = default;
-    ~FairOrder();
-    FairOrder(const FairOrder&) = delete;
-    FairOrder& operator=(const FairOrder&) = delete;
+    using Duration = FairShares::Duration;
 
     struct Item {
         TurnItem run;
         bool mayTakeLong = false;
     };
-    struct User;
     struct Lane;
 
     using RoomHandler = std::function<void()>;
@@ -46,7 +36,7 @@ public:
     static void setRoomHandler(Lane& lane, std::shared_ptr<const RoomHandler> handler);
 
     // Whether items of several lanes wait or are being served.
-    [[nodiscard]] bool isContested() const;
+    [[nodiscard]] bool isContested() const { return shares_.isContested(); }
     // The number of items that wait.
     [[nodiscard]] std::size_t waiting() const noexcept { return waiting_; }
     // The item that runs next; not when none waits.
@@ -59,12 +49,7 @@ public:
     void charge(Duration time);
 
 private:
-    // Those that have items waiting, or are being served, by the time that they used.
-    template <typename Contestant> using Contest = std::multimap<Duration, std::shared_ptr<Contestant>>;
-
-    std::map<std::uint32_t, std::weak_ptr<User>> users_;
-    Contest<User> contest_;
-    Duration now_{}; // what the user that was served last had used before
+    FairShares shares_;
     std::size_t waiting_ = 0;
 };
 

@@ -55,8 +55,10 @@ public:
             thisThread.toHelp = shared_from_this();
         const foundation::Lock lock(lock_);
         order_.add(lane, {std::move(item), mayTakeLong});
-        const bool isLeftToHelper = mayHelp && order_.waiting() <= mostItemsHelpedWith && !mayTakeLong;
-        if (!isTurnTaken_ && !isLeftToHelper)
+        if (isTurnTaken_)
+            return;
+        isLeftToHelper_ = mayHelp && order_.waiting() <= mostItemsHelpedWith && !mayTakeLong;
+        if (!isLeftToHelper_)
             wakeThread(); // under the lock: after it, the item may destroy the queue
     }
 
@@ -65,6 +67,7 @@ public:
     {
         const foundation::Lock lock(lock_);
         isEnding_ = true;
+        isLeftToHelper_ = false;
         wakeThread();
     }
 
@@ -87,6 +90,7 @@ public:
     {
         {
             const foundation::Lock lock(lock_);
+            isLeftToHelper_ = false;
             if (isTurnTaken_ || order_.waiting() == 0 || order_.waiting() > mostItemsHelpedWith)
                 return;
             takeTurn();
@@ -135,7 +139,7 @@ private:
     Duty waitForDuty(const ThreadHeap& heap)
     {
         const foundation::Lock lock(lock_);
-        while (order_.waiting() == 0 || isTurnTaken_) {
+        while (order_.waiting() == 0 || isTurnTaken_ || isLeftToHelper_) {
             if (std::exchange(isTurnLeft_, false))
                 return Duty::Turn;
             if (isEnding_ && !isTurnTaken_)
@@ -247,6 +251,7 @@ private:
 
     std::size_t takenInTurn_ KESTO_GUARDED_BY(lock_) = 0;
     bool isTurnTaken_ KESTO_GUARDED_BY(lock_) = false; // a thread is running one
+    bool isLeftToHelper_ KESTO_GUARDED_BY(lock_) = false; // what waits: a helper is about to come
     bool isTurnLeft_ KESTO_GUARDED_BY(lock_) = false; // by a helper, for the queue's thread
     bool isAsleep_ KESTO_GUARDED_BY(lock_) = false; // the queue's thread sleeps, and has not been woken yet
     bool isEnding_ KESTO_GUARDED_BY(lock_) = false;
