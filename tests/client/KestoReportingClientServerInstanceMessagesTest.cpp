@@ -1,5 +1,6 @@
 // The delivery of a message: its receivers, its order, and its sender.
 #include "client/KestoReportingClientServerInstance.h"
+#include "support/EmittedCodes.h"
 #include "support/ServiceHarness.h"
 
 #include <gmock/gmock.h>
@@ -11,16 +12,15 @@ using enum platform::LogLevel;
 using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
+using support::clientSendMessage;
+using support::sessionCreated;
+using support::sessionDestroyed;
+using support::sessionMessageAccepted;
 using testing::_;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Return;
 using testing::SizeIs;
-
-constexpr std::uint32_t clientSendMessage = 0x21044824;
-constexpr std::uint32_t sessionCreated = 0x21044828;
-constexpr std::uint32_t sessionDestroyed = 0x21044834;
-constexpr std::uint32_t sessionMessageAccepted = 0x21044838;
 
 std::string described(const TestClient& client, std::int64_t reporterID)
 {

@@ -2,6 +2,7 @@
 // client's sessions each of them reaches.
 #include "client/KestoReportingClientServerInstance.h"
 #include "platform/linux/connection/FrameReader.h"
+#include "support/EmittedCodes.h"
 #include "support/ServiceHarness.h"
 
 #include <cstdlib>
@@ -15,19 +16,18 @@ using enum platform::LogLevel;
 using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
+using support::clientCreate;
+using support::clientDestroy;
+using support::clientSendMessage;
+using support::clientStart;
+using support::clientStop;
+using support::sessionCreated;
+using support::sessionDestroyed;
+using support::sessionMessageAccepted;
+using support::sessionStarted;
+using support::sessionStopping;
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-constexpr std::uint32_t clientCreate = 0x21044814;
-constexpr std::uint32_t clientStart = 0x21044818;
-constexpr std::uint32_t clientStop = 0x2104481C;
-constexpr std::uint32_t clientDestroy = 0x21044820;
-constexpr std::uint32_t clientSendMessage = 0x21044824;
-constexpr std::uint32_t sessionCreated = 0x21044828;
-constexpr std::uint32_t sessionStarted = 0x2104482C;
-constexpr std::uint32_t sessionStopping = 0x21044830;
-constexpr std::uint32_t sessionDestroyed = 0x21044834;
-constexpr std::uint32_t sessionMessageAccepted = 0x21044838;
 
 constexpr Answers::size_type once = 1;
 

@@ -57,8 +57,6 @@ TEST_P(BadInputTest, EndsThatConnectionWithOneLineAndNoOther)
     EXPECT_EQ(kestod.events("com.quarn.kesto.Playback.*").size(), 2U);
 }
 
-const Value null{};
-
 INSTANTIATE_TEST_SUITE_P(
     OfEveryKind, BadInputTest,
     testing::Values(

@@ -1,6 +1,7 @@
 // The whole path, from a client's call to a stored event, through a real service.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
+#include "support/MessageKinds.h"
 
 #include <csignal>
 #include <gmock/gmock.h>
@@ -13,15 +14,14 @@ namespace {
 using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
+using support::playback;
+using support::typeStart;
 using testing::ElementsAre;
 using testing::Field;
 using testing::HasSubstr;
 using testing::MatchesRegex;
 using testing::SizeIs;
 
-const Value null{};
-constexpr int playback = 4;
-constexpr int typeStart = 1;
 constexpr int typeStop = 2;
 constexpr std::string_view uptimeEvent = "com.quarn.kesto.kestoreportingclientuptime";
 

@@ -4,6 +4,7 @@
 #include "end_to_end/ServiceManager.h"
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
+#include "support/MessageKinds.h"
 
 #include <algorithm>
 #include <atomic>
@@ -31,6 +32,8 @@ namespace {
 using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
+using support::playback;
+using support::typeStart;
 using testing::AnyOf;
 using testing::Each;
 using testing::Field;
@@ -42,8 +45,6 @@ using testing::SizeIs;
 using namespace std::chrono_literals;
 using Clock = std::chrono::steady_clock;
 
-constexpr int playback = 4;
-constexpr int typeStart = 1;
 constexpr std::string_view uptimeEvents = "com.quarn.kesto.kestoreportingclientuptime";
 constexpr std::string_view volumeEvents = "com.quarn.kesto.Volume.Summary";
 constexpr std::string_view startEvents = "com.quarn.kesto.Playback.Start";

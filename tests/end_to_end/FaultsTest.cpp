@@ -4,6 +4,7 @@
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
 #include "platform/linux/damage/DatabaseDamage.h"
+#include "support/MessageKinds.h"
 #include "support/Sanitizers.h"
 
 #include <algorithm>
@@ -26,10 +27,9 @@ using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
 using ledger::Counter;
+using support::playback;
+using support::typeStart;
 using testing::IsEmpty;
-
-constexpr int playback = 4;
-constexpr int typeStart = 1;
 
 class FaultsTest : public testing::Test {
 protected:

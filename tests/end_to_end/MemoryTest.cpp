@@ -2,6 +2,7 @@
 // back.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
+#include "support/MessageKinds.h"
 #include "support/Sanitizers.h"
 
 #include <fstream>
@@ -13,11 +14,12 @@
 namespace end_to_end {
 namespace {
 
+using support::playback;
+using support::typeStart;
+
 using foundation::Array;
 using foundation::Dictionary;
 
-constexpr int playback = 4;
-constexpr int typeStart = 1;
 constexpr double megabyte = 1024; // in the kernel's unit
 
 class MemoryTest : public testing::Test {

@@ -28,6 +28,8 @@ enum WireMethod : std::uint8_t {
     KillService
 };
 
+inline const foundation::Value null;
+
 // One thread.
 class WireClient {
 public:

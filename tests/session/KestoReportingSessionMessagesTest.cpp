@@ -1,5 +1,7 @@
 // A session's handling of a message: it normalises it, compares it with the previous one of its kind, and records it.
 #include "session/KestoReportingSession.h"
+#include "support/EmittedCodes.h"
+#include "support/MessageKinds.h"
 #include "support/TestPlatform.h"
 
 #include <charconv>
@@ -13,17 +15,17 @@ using enum platform::LogLevel;
 using foundation::Dictionary;
 using foundation::Value;
 using support::IsLine;
+using support::playback;
+using support::sessionMessageAccepted;
 using testing::Contains;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::Not;
 using testing::SizeIs;
 
-constexpr AudioEventCategory playback = 4;
 constexpr AudioEventCategory errorCategory = 11;
 constexpr AudioEventType start = 1;
 constexpr AudioEventType errorType = 6;
-constexpr std::uint32_t acceptedMarker = 0x21044838;
 
 Dictionary record(const std::string& identifier, const Dictionary& payload)
 {
@@ -293,7 +295,7 @@ TEST_F(SessionMessagesTest, ToASessionThatIsNotStartedAreNotRecorded)
     EXPECT_FALSE(session->createMessageIdentifier(platform.turn.tally, playback, start, {{"a", 1}}));
     EXPECT_EQ(session->nestedAggregatedPayloadData(), std::nullopt);
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "sending message for session owned by 42")));
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(acceptedMarker));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionMessageAccepted));
 }
 
 // --- markers and replies
@@ -302,7 +304,7 @@ TEST_F(SessionMessagesTest, LeaveAMarkerEachRecordedOrNot)
 {
     send(Dictionary{{"a", 1}});
     send(Dictionary{{"a", 1}});
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(acceptedMarker, acceptedMarker));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionMessageAccepted, sessionMessageAccepted));
 }
 
 TEST_F(SessionMessagesTest, AreAnsweredBeforeTheCallReturnsWithNoErrorWhateverBecomesOfThem)

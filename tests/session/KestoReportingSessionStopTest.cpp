@@ -2,6 +2,8 @@
 #include "session/AllocatedBytes.h"
 #include "session/KestoReportingSession.h"
 #include "session/StoredMessages.h"
+#include "support/EmittedCodes.h"
+#include "support/MessageKinds.h"
 #include "support/Sanitizers.h"
 #include "support/TestPlatform.h"
 
@@ -14,16 +16,15 @@ using enum platform::LogLevel;
 using foundation::Dictionary;
 using foundation::Value;
 using support::IsLine;
+using support::playback;
+using support::sessionMessageAccepted;
+using support::sessionStopping;
 using testing::Contains;
 using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::IsEmpty;
 using testing::Not;
 using testing::SizeIs;
-
-constexpr AudioEventCategory playback = 4;
-constexpr std::uint32_t stopping = 0x21044830;
-constexpr std::uint32_t accepted = 0x21044838;
 
 class SessionStop : public testing::Test {
 protected:
@@ -66,7 +67,7 @@ protected:
         platform.analytics.setObserver(
             [&](const std::string& name) { steps.push_back(name + " after " + identifiers().back()); });
         platform.traceEmitter.setObserver([&](std::uint32_t code) {
-            if (code == accepted)
+            if (code == sessionMessageAccepted)
                 steps.push_back("recorded " + identifiers().back());
         });
         session->stop(platform.turn);
@@ -145,7 +146,8 @@ TEST_F(SessionStop, MarksItsMomentsForTheKernelTrace)
     play();
     platform.traceEmitter.take();
     session->stop(platform.turn);
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(stopping, accepted, accepted, accepted));
+    EXPECT_THAT(platform.traceEmitter.take(),
+                ElementsAre(sessionStopping, sessionMessageAccepted, sessionMessageAccepted, sessionMessageAccepted));
 }
 
 TEST_F(SessionStop, HandsVolumeEventsToTheBridgeAsTheyWereMade)
@@ -388,7 +390,7 @@ TEST_F(LargeSessionStop, TakesNoMoreMemoryThanTheBudgetHas)
     sendEnd();
     std::size_t recorded = 0;
     platform.traceEmitter.setObserver([&](std::uint32_t code) {
-        recorded += code == accepted ? 1 : 0;
+        recorded += code == sessionMessageAccepted ? 1 : 0;
         platform.analytics.clear(); // the events that it keeps here take memory, too
     });
     session->stop(platform.turn);
@@ -410,7 +412,7 @@ TEST_F(LargeSessionStop, GoesOnPayingForTheVolumeEventsThatItHasNotRecordedYet)
     std::ptrdiff_t mostUnpaid = 0;
     platform.traceEmitter.setObserver([&](std::uint32_t code) {
         platform.analytics.clear();
-        if (code == accepted)
+        if (code == sessionMessageAccepted)
             mostUnpaid = std::max(mostUnpaid, allocated() - static_cast<std::ptrdiff_t>(budget->taken()));
     });
     session->stop(platform.turn);

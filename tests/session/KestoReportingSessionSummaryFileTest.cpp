@@ -1,6 +1,7 @@
 // The summary file: its place, its name, its content, and the log line when it cannot be written.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
+#include "support/MessageKinds.h"
 #include "support/ParseJson.h"
 #include "support/TestPlatform.h"
 
@@ -16,6 +17,7 @@ using enum platform::LogLevel;
 using foundation::Dictionary;
 using foundation::Value;
 using support::IsLine;
+using support::playback;
 using testing::Contains;
 using testing::Each;
 using testing::ElementsAre;
@@ -25,8 +27,6 @@ using testing::Key;
 using testing::Pair;
 using testing::SizeIs;
 using testing::StartsWith;
-
-constexpr AudioEventCategory playback = 4;
 
 Value parse(const std::string& text)
 {

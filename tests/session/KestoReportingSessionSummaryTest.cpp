@@ -2,6 +2,7 @@
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"
 #include "session/NaiveAggregation.h"
+#include "support/MessageKinds.h"
 #include "support/TestPlatform.h"
 
 #include <algorithm>
@@ -13,9 +14,8 @@ namespace {
 
 using foundation::Dictionary;
 using foundation::Value;
+using support::playback;
 using testing::SizeIs;
-
-constexpr AudioEventCategory playback = 4;
 
 class Summary : public testing::Test {
 protected:

@@ -1,6 +1,7 @@
 // A session's life: its initial state, its growing configuration, and the beginning and end of a run.
 #include "session/KestoReportingSession.h"
 #include "foundation/cbor/Cbor.h"
+#include "support/EmittedCodes.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>
@@ -12,15 +13,14 @@ using enum platform::LogLevel;
 using foundation::Dictionary;
 using foundation::Value;
 using support::IsLine;
+using support::sessionCreated;
+using support::sessionDestroyed;
+using support::sessionMessageAccepted;
+using support::sessionStarted;
+using support::sessionStopping;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
-
-constexpr std::uint32_t created = 0x21044828;
-constexpr std::uint32_t started = 0x2104482C;
-constexpr std::uint32_t stopping = 0x21044830;
-constexpr std::uint32_t destroyed = 0x21044834;
-constexpr std::uint32_t accepted = 0x21044838;
 
 class SessionTest : public testing::Test {
 protected:
@@ -56,7 +56,7 @@ TEST_F(SessionTest, SaysAndMarksThatItWasMade)
 {
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "created reporting session for ID: 42")));
     EXPECT_EQ(platform.log.lines()[0].name, "KestoReportingSession");
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(created));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionCreated));
 }
 
 TEST_F(SessionTest, SaysAndMarksThatItGoes)
@@ -64,7 +64,7 @@ TEST_F(SessionTest, SaysAndMarksThatItGoes)
     forget();
     session.reset();
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "deallocing this session 42")));
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(destroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionDestroyed));
 }
 
 TEST_F(SessionTest, SaysThatItWasMadeBeforeItMarksItAndMarksThatItGoesBeforeItSaysIt)
@@ -76,8 +76,8 @@ TEST_F(SessionTest, SaysThatItWasMadeBeforeItMarksItAndMarksThatItGoesBeforeItSa
     platform.log.setObserver(nullptr);
     platform.traceEmitter.setObserver(nullptr);
     EXPECT_THAT(steps,
-                ElementsAre("created reporting session for ID: 43", std::to_string(created), std::to_string(destroyed),
-                            "deallocing this session 42"));
+                ElementsAre("created reporting session for ID: 43", std::to_string(sessionCreated),
+                            std::to_string(sessionDestroyed), "deallocing this session 42"));
 }
 
 TEST_F(SessionTest, GoesWithoutStoppingWhenItIsLetGoOfWhileStarted)
@@ -86,7 +86,7 @@ TEST_F(SessionTest, GoesWithoutStoppingWhenItIsLetGoOfWhileStarted)
     forget();
     session.reset();
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Info, "kerr", "deallocing this session 42")));
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(destroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionDestroyed));
 }
 
 TEST_F(SessionTest, TakesAnyNumberForItsIdentity)
@@ -359,7 +359,7 @@ TEST_F(SessionTest, BeginsARunWithAnEmptyStore)
     EXPECT_THAT(*session->nestedAggregatedPayloadData(), IsEmpty());
     EXPECT_EQ(session->messageIdentifierCounts(), Dictionary());
     EXPECT_THAT(platform.log.lines(), ElementsAre(IsLine(Debug, "kerr", "starting session owned by 42")));
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(started));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionStarted));
 }
 
 TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
@@ -369,7 +369,7 @@ TEST_F(SessionTest, IsStartedAndHasItsEmptyStoreWhenItMarksItsStart)
     session->stop(platform.turn);
     std::optional<std::size_t> messages;
     platform.traceEmitter.setObserver([&](std::uint32_t code) {
-        EXPECT_EQ(code, started);
+        EXPECT_EQ(code, sessionStarted);
         EXPECT_TRUE(session->started());
         if (const auto store = session->nestedAggregatedPayloadData())
             messages = store->size();
@@ -407,7 +407,7 @@ TEST_F(SessionTest, EndsARunAndDropsWhatItRecorded)
     ASSERT_THAT(lines, SizeIs(testing::Ge(2U)));
     EXPECT_THAT(lines[0], IsLine(Debug, "kerr", "ending session 42"));
     EXPECT_THAT(lines[1], IsLine(Debug, "kerr", "ending session 42"));
-    EXPECT_EQ(platform.traceEmitter.take().front(), stopping);
+    EXPECT_EQ(platform.traceEmitter.take().front(), sessionStopping);
 }
 
 TEST_F(SessionTest, SaysTwiceThatItEndsBeforeItMarksIt)
@@ -421,7 +421,7 @@ TEST_F(SessionTest, SaysTwiceThatItEndsBeforeItMarksIt)
     platform.traceEmitter.setObserver(nullptr);
     ASSERT_THAT(steps, SizeIs(testing::Ge(3U)));
     steps.resize(3);
-    EXPECT_THAT(steps, ElementsAre("ending session 42", "ending session 42", std::to_string(stopping)));
+    EXPECT_THAT(steps, ElementsAre("ending session 42", "ending session 42", std::to_string(sessionStopping)));
 }
 
 TEST_F(SessionTest, StoppedWithoutAStartOnlySaysSo)
@@ -459,11 +459,11 @@ TEST_F(SessionTest, MarksEveryPointOfItsLifeInOrder)
     session->setServiceType(4);
     session->start();
     session->sendMessage(platform.turn.tally, Dictionary{{"a", 1}}, 4, 1, nullptr);
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(created, started, accepted));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionCreated, sessionStarted, sessionMessageAccepted));
     session->stop(platform.turn);
-    EXPECT_EQ(platform.traceEmitter.take().front(), stopping);
+    EXPECT_EQ(platform.traceEmitter.take().front(), sessionStopping);
     session.reset();
-    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(destroyed));
+    EXPECT_THAT(platform.traceEmitter.take(), ElementsAre(sessionDestroyed));
 }
 
 class UntracedSessionTest : public SessionTest,

@@ -185,13 +185,13 @@ TEST(MessageStore, RecordsWhatIsNoNumberEachTimeSinceItEqualsNothing)
 // message goes to one session twice.
 TEST(MessageStore, NeverTakesAPayloadThatHoldsWhatIsNoNumberForARepetition)
 {
-    const Value nan = std::numeric_limits<double>::quiet_NaN();
+    const Value notANumber = std::numeric_limits<double>::quiet_NaN();
     const std::string large(1500, 'x'); // too large to be kept decoded
     for (const Dictionary& payload :
-         {Dictionary{{"a", nan}}, Dictionary{{"a", Value(std::numeric_limits<float>::quiet_NaN())}},
-          Dictionary{{"a", Dictionary{{"b", nan}}}}, Dictionary{{"a", Array{1, nan}}},
-          Dictionary{{"a", Array{Dictionary{{"b", nan}}}}}, Dictionary{{"a", nan}, {"b", large}},
-          Dictionary{{"a", Dictionary{{"b", nan}}}, {"b", large}}}) {
+         {Dictionary{{"a", notANumber}}, Dictionary{{"a", Value(std::numeric_limits<float>::quiet_NaN())}},
+          Dictionary{{"a", Dictionary{{"b", notANumber}}}}, Dictionary{{"a", Array{1, notANumber}}},
+          Dictionary{{"a", Array{Dictionary{{"b", notANumber}}}}}, Dictionary{{"a", notANumber}, {"b", large}},
+          Dictionary{{"a", Dictionary{{"b", notANumber}}}, {"b", large}}}) {
         session::MessageStore store(plenty());
         EXPECT_EQ(store.record(4, 1, payload), Outcome::Recorded);
         EXPECT_EQ(store.record(4, 1, payload), Outcome::Recorded) << Value(payload).text();

@@ -65,7 +65,7 @@ std::string written(const AudioIssueDetected& record)
     return bytes;
 }
 
-bool read(AudioIssueDetected& record, const std::string& bytes)
+bool isReadInto(AudioIssueDetected& record, const std::string& bytes)
 {
     const GuardedBytes guarded(bytes);
     ProtobufReader reader(guarded.view());
@@ -116,7 +116,7 @@ RC_GTEST_PROP(AudioIssueDetectedPeer, WritesWhatWeRead, ())
 {
     const AudioIssueDetected record = generatedRecord();
     AudioIssueDetected again;
-    RC_ASSERT(read(again, peerOf(record).SerializeAsString()));
+    RC_ASSERT(isReadInto(again, peerOf(record).SerializeAsString()));
     RC_ASSERT(again == record);
 }
 
@@ -125,7 +125,7 @@ RC_GTEST_PROP(AudioIssueDetectedPeer, FindsTheSameFieldsAmongForeignOnes, ())
     const std::string bytes = generatedFields() + written(generatedRecord()) + generatedFields();
     AudioIssueDetected record;
     peer::AudioIssueDetected other;
-    RC_ASSERT(read(record, bytes));
+    RC_ASSERT(isReadInto(record, bytes));
     RC_ASSERT(other.ParseFromString(bytes));
     RC_ASSERT(haveSameFields(record, other));
 }
@@ -142,7 +142,7 @@ RC_GTEST_PROP(AudioIssueDetectedPeer, AcceptsWhatWeAcceptOfBrokenBytes, ())
         {{1, rc::gen::inRange<std::size_t>(0, bytes.size())}, {2, rc::gen::just(bytes.size())}}));
     AudioIssueDetected record;
     peer::AudioIssueDetected other;
-    const bool isRead = read(record, bytes);
+    const bool isRead = isReadInto(record, bytes);
     RC_CLASSIFY(isRead, "read");
     if (!isRead)
         return;
@@ -166,7 +166,8 @@ TEST(AudioIssueDetectedPeer, NestsGroupsAsDeepAsWeDo)
     const auto nested = [](unsigned depth) { return std::string(depth, '\x4B') + std::string(depth, '\x4C'); };
     for (const unsigned depth : {ProtobufReader::deepestGroup, ProtobufReader::deepestGroup + 1}) {
         AudioIssueDetected record;
-        EXPECT_EQ(read(record, nested(depth)), peer::AudioIssueDetected().ParseFromString(nested(depth))) << depth;
+        EXPECT_EQ(isReadInto(record, nested(depth)), peer::AudioIssueDetected().ParseFromString(nested(depth)))
+            << depth;
     }
 }
 

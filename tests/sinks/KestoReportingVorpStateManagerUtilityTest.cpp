@@ -1,5 +1,6 @@
 // When a leaked haptics session is suspected, and the request for a snapshot.
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
+#include "support/MessageKinds.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>
@@ -12,13 +13,13 @@ using foundation::Dictionary;
 using foundation::Value;
 using platform::LogLevel;
 using support::IsLine;
+using support::playback;
 using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
 using enum LogLevel;
 
 constexpr AudioEventType gimbo = 8;
-constexpr AudioEventCategory playback = 4;
 
 Dictionary hapticTime(const Value& seconds)
 {

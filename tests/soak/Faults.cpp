@@ -3,6 +3,7 @@
 
 #include "end_to_end/WireClient.h"
 #include "platform/linux/damage/DatabaseDamage.h"
+#include "support/MessageKinds.h"
 
 #include <csignal>
 #include <sqlite3.h>
@@ -12,15 +13,15 @@
 namespace soak {
 namespace {
 
+using support::playback;
+using support::typeStart;
+
 namespace fs = std::filesystem;
 using namespace end_to_end;
 using namespace std::chrono_literals;
 using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
-
-constexpr int playback = 4;
-constexpr int typeStart = 1;
 
 fs::path store(const Scene& scene, const char* suffix = "")
 {

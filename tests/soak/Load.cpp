@@ -2,6 +2,7 @@
 #include "soak/Load.h"
 
 #include "end_to_end/WireClient.h"
+#include "support/MessageKinds.h"
 
 #include <array>
 #include <cmath>
@@ -11,12 +12,13 @@
 namespace soak {
 namespace {
 
+using support::playback;
+using support::typeStart;
+
 using namespace end_to_end;
 using foundation::Array;
 using foundation::Dictionary;
 
-constexpr int playback = 4;
-constexpr int typeStart = 1;
 constexpr std::size_t window = 16;
 
 // New ones, repetitions, large ones, and some that JSON cannot express.

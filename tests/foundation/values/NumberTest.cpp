@@ -12,7 +12,7 @@
 namespace foundation {
 namespace {
 
-using Kind = Number::Kind;
+using NumberKind = Number::Kind;
 
 constexpr auto leastInt64 = std::numeric_limits<std::int64_t>::min();
 constexpr auto mostInt64 = std::numeric_limits<std::int64_t>::max();
@@ -23,13 +23,13 @@ constexpr std::int64_t twoTo53 = std::int64_t{1} << 53;
 
 TEST(Number, RemembersItsKind)
 {
-    EXPECT_EQ(Number().kind(), Kind::Signed64);
-    EXPECT_EQ(Number(true).kind(), Kind::Boolean);
-    EXPECT_EQ(Number(1).kind(), Kind::Signed64);
-    EXPECT_EQ(Number(1U).kind(), Kind::Unsigned64);
-    EXPECT_EQ(Number(std::uint8_t{1}).kind(), Kind::Unsigned64);
-    EXPECT_EQ(Number(1.0F).kind(), Kind::Float32);
-    EXPECT_EQ(Number(1.0).kind(), Kind::Float64);
+    EXPECT_EQ(Number().kind(), NumberKind::Signed64);
+    EXPECT_EQ(Number(true).kind(), NumberKind::Boolean);
+    EXPECT_EQ(Number(1).kind(), NumberKind::Signed64);
+    EXPECT_EQ(Number(1U).kind(), NumberKind::Unsigned64);
+    EXPECT_EQ(Number(std::uint8_t{1}).kind(), NumberKind::Unsigned64);
+    EXPECT_EQ(Number(1.0F).kind(), NumberKind::Float32);
+    EXPECT_EQ(Number(1.0).kind(), NumberKind::Float64);
     EXPECT_TRUE(Number(1.0F).isFloat());
     EXPECT_FALSE(Number(1U).isFloat());
 }

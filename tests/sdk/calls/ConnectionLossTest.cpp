@@ -22,7 +22,6 @@ using sdk_test::Peer;
 using testing::ElementsAre;
 using testing::UnorderedElementsAre;
 
-constexpr std::chrono::milliseconds longEnough = sdk_test::patience;
 const std::string lost = ": the connection to the service was lost";
 
 class ConnectionLossTest : public sdk_test::ServedClientTest {
@@ -58,7 +57,7 @@ TEST_F(ConnectionLossTest, AnswersEverythingUnansweredOnceAndTellsTheStateAfterT
 
     EXPECT_EQ(client_.createSession(43), Status::NotConnected);
     EXPECT_EQ(send(), Status::NotConnected);
-    EXPECT_EQ(client_.flush(longEnough), Status::NotConnected);
+    EXPECT_EQ(client_.flush(sdk_test::patience), Status::NotConnected);
     const kesto::Statistics statistics = client_.statistics();
     EXPECT_EQ(statistics.queued, 1U);
     EXPECT_EQ(statistics.sent, 1U);
@@ -86,7 +85,7 @@ TEST_F(ConnectionLossTest, TellsAFlushThatWaits)
     service_.emplace(path_, [](Peer& peer, const Array&) { peer.close(); });
     open(false);
     client_.createSession(42);
-    EXPECT_THAT(client_.flush(longEnough),
+    EXPECT_THAT(client_.flush(sdk_test::patience),
                 testing::AnyOf(Status::ConnectionLost, // during the wait, or before it
                                Status::NotConnected));
 }
@@ -135,7 +134,7 @@ TEST_F(ConnectionLossTest, ConnectsAgainWhenTheServiceIsBackAndBeginsWithoutSess
     };
     ASSERT_EQ(client.open(options), Status::Ok);
     ASSERT_EQ(connected.waitFor(1).size(), 1U);
-    ASSERT_EQ(client.flush(longEnough), Status::Ok);
+    ASSERT_EQ(client.flush(sdk_test::patience), Status::Ok);
     service_.reset();
     EXPECT_THAT(answers_.waitFor(1), ElementsAre("start" + lost));
     service_.emplace(path_);
@@ -299,7 +298,7 @@ RC_GTEST_PROP(HostileService, NeverHurtsItsClientWhateverItSends, ())
     RC_ASSERT(client.open(options) == Status::Ok);
     std::size_t taken = client.createSession(42, answers.named("create")) == Status::Ok ? 1 : 0;
     taken += client.validate(42, answers.named("validate")) == Status::Ok ? 1 : 0; // unless the connection has ended
-    client.close(longEnough);
+    client.close(sdk_test::patience);
     RC_ASSERT(answers.entries().size() == taken);
 }
 

@@ -37,8 +37,6 @@ using sdk_test::Answers;
 using sdk_test::FakeService;
 using testing::ElementsAre;
 
-constexpr std::chrono::milliseconds longEnough = sdk_test::patience;
-
 class SendTest : public sdk_test::ServedClientTest {
 protected:
     void connect(FakeService::Handler handler = sdk_test::answerObediently, kesto::Options options = {})
@@ -76,7 +74,7 @@ TEST_F(SendTest, CountsWhatBecameOfEveryMessage)
     for (int count = 0; count < 10; ++count)
         EXPECT_EQ(send(message), Status::Ok);
     EXPECT_EQ(send(unfinished), Status::Misnested);
-    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.flush(sdk_test::patience), Status::Ok);
     const kesto::Statistics statistics = client_.statistics();
     EXPECT_EQ(statistics.queued, 10U);
     EXPECT_EQ(statistics.sent, 10U);
@@ -97,7 +95,7 @@ TEST_F(SendTest, RefusesAMessageOfMoreThanAQuarterOfTheQueue)
     EXPECT_EQ(client_.setConfiguration(large, 42), Status::Ok) << "the queue does not limit a configuration";
     kesto::Message small;
     EXPECT_EQ(send(small.add("text", std::string(500, 'x'))), Status::Ok);
-    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.flush(sdk_test::patience), Status::Ok);
     EXPECT_EQ(client_.send(small, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(200, 1)),
               Status::TooLarge);
 }
@@ -122,7 +120,7 @@ TEST_F(SendTest, SendsWhatFitsIntoAFrameAndRefusesWhatDoesNot)
         const Status status = sendText(length);
         if (status == Status::Ok) {
             fits = length;
-            EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+            EXPECT_EQ(client_.flush(sdk_test::patience), Status::Ok);
             ++sent;
         } else {
             ASSERT_EQ(status, Status::TooLarge);
@@ -143,7 +141,7 @@ TEST_F(SendTest, SendsToAsManyReportersAsTheServiceTakes)
     const kesto::Message message;
     EXPECT_EQ(client_.send(message, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(most, 1)),
               Status::Ok);
-    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.flush(sdk_test::patience), Status::Ok);
     EXPECT_EQ(client_.send(message, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(most + 1, 1)),
               Status::TooLarge);
 }
@@ -195,7 +193,7 @@ TEST_F(SendTest, DoesNotPileUpBytesForAServiceThatDoesNotRead)
         taken += send(message) == Status::Ok ? 1 : 0;
     EXPECT_LT(taken * 8000, 2U * 1024 * 1024) << "the queue, the outbox and the socket's buffer, and no more";
     service_->setReading(true);
-    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.flush(sdk_test::patience), Status::Ok);
     EXPECT_EQ(client_.statistics().answered, taken);
 }
 
@@ -218,7 +216,7 @@ TEST_F(SendTest, TakesMessagesOfManyThreadsAndKeepsTheOrderOfEach)
         });
     for (std::thread& sender : senders)
         sender.join();
-    EXPECT_EQ(client_.flush(longEnough), Status::Ok);
+    EXPECT_EQ(client_.flush(sdk_test::patience), Status::Ok);
     EXPECT_EQ(client_.statistics().answered, std::uint64_t{threads * messagesEach});
     std::map<std::int64_t, std::int64_t> next;
     for (const Array& call : service_->waitForCalls(threads * messagesEach + 2)) {
@@ -258,7 +256,7 @@ TEST_F(SendTest, ReachesTheServiceWithoutRingingWhileASessionIsStarted)
     connect();
     client_.createSession(42);
     client_.startSession(42);
-    ASSERT_EQ(client_.flush(longEnough), Status::Ok);
+    ASSERT_EQ(client_.flush(sdk_test::patience), Status::Ok);
     const kesto::Message message;
     for (std::size_t count = 1; count <= 10; ++count) {
         ASSERT_EQ(client_.send(message, Category::IO, EventType::Error, 42, answers_.named("send")), Status::Ok);
@@ -316,7 +314,7 @@ constexpr std::uint64_t messagesWithoutSystemCalls = 20'000;
     client.createSession(42);
     if (isStarted)
         client.startSession(42);
-    else if (client.flush(longEnough) != Status::Ok)
+    else if (client.flush(sdk_test::patience) != Status::Ok)
         ::_exit(2);
     kesto::Message message;
     message.reserve(1024);

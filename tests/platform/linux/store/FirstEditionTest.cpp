@@ -182,8 +182,8 @@ TEST_F(FirstEditionTest, WithoutEventsOnlyItsLastNumberIsRemembered)
 
 TEST_F(FirstEditionTest, ItsEventsAreAsOldAsTheirStampsSayWhereTheseMakeSense)
 {
-    constexpr double day = 86400;
-    clock.set(100 * day);
+    constexpr double aDay = 86400;
+    clock.set(100 * aDay);
     makeFirstEdition("INSERT INTO events VALUES (1, 9000 * 86400, 'future', '{}'), (2, 50 * 86400, 'old', '{}'), "
                      "(3, 0, '1970', '{}'), (4, 70 * 86400, 'young', '{}')");
     const auto keeper = makeKeeper();
@@ -194,7 +194,7 @@ TEST_F(FirstEditionTest, ItsEventsAreAsOldAsTheirStampsSayWhereTheseMakeSense)
     keeper->setConfiguration({.maximumAgeDays = 29, .maximumSizeMegabytes = 1024});
     moveAll(*keeper);
     EXPECT_THAT(StoreReader(file).texts("SELECT name FROM events ORDER BY id"), ElementsAre("young"));
-    clock.advance(day);
+    clock.advance(aDay);
     keeper->setConfiguration({.maximumAgeDays = 30, .maximumSizeMegabytes = 1024});
     moveAll(*keeper);
     EXPECT_EQ(StoreReader(file).eventCount(), 1) << "what came last counts as kept when it was opened";

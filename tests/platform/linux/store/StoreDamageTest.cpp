@@ -549,16 +549,16 @@ TEST_F(StoreDamageTest, SavedEventsKeepTheirNumbersAndTimesAndNewOnesGetHigherNu
 
 TEST_F(StoreDamageTest, SavedEventsKeepTheirAge)
 {
-    constexpr double day = 86400;
+    constexpr double aDay = 86400;
     keep(10, "com.quarn.old");
-    clock.advance(60 * day); // of 90
+    clock.advance(60 * aDay); // of 90
     keep(10, "com.quarn.newer");
     close();
     support::overwrite(file, 0, std::string(pageSize, 'x'));
     keep(1, "com.quarn.after");
     settle();
     EXPECT_EQ(storedEvents("com.quarn.old"), 10);
-    clock.advance(40 * day);
+    clock.advance(40 * aDay);
     keep(1, "com.quarn.after");
     waitFor([this] { return storedEvents("com.quarn.old") == 0; });
     close();
