@@ -151,7 +151,13 @@ private:
         void emit(std::uint32_t, const std::array<std::uint64_t, 4>&) override { }
     };
     class ReportingChannels final : public platform::ReportingChannels {
-        FoundChannels copyChannelsInGroup(std::optional<std::string_view>, std::optional<std::string_view>) override
+        [[nodiscard]] std::shared_ptr<const Moment>
+        readChannels(const std::vector<platform::ChannelSelection>&) override
+        {
+            return std::make_shared<Moment>();
+        }
+        FoundChannels copyChannelsInGroup(std::optional<std::string_view>, std::optional<std::string_view>,
+                                          const Moment&) override
         {
             return {};
         }
@@ -161,7 +167,7 @@ private:
             return {.subscription = nullptr, .channels = nullptr, .error = unavailable};
         }
         std::expected<platform::ReportingSample, platform::ReportingChannelError>
-        createSamples(const Subscription&, const ChannelSet&) override
+        createSamples(const Subscription&, const ChannelSet&, const Moment&) override
         {
             return std::unexpected(unavailable);
         }

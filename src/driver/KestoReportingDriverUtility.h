@@ -17,6 +17,7 @@ class KestoReportingDriverUtility {
 public:
     // Statistics by key, gathered before they become a dictionary.
     using DriverStats = foundation::Dictionary::Entries;
+    using Moment = platform::ReportingChannels::Moment;
 
     // Subscribes to the eight driver groups; leaves out a group if this fails.
     KestoReportingDriverUtility();
@@ -26,12 +27,18 @@ public:
         return ioChannelSubscriptions_;
     }
 
+    // The channels of all subscribed drivers at this moment; null without subscriptions. May wait for the disk. Any
+    // thread.
+    [[nodiscard]] std::shared_ptr<const Moment> readMoment() const;
+
     // A sample of every subscribed driver, by the driver's description. A sample that fails is left out.
-    [[nodiscard]] session::DriverSnapShot getSnapShot() const;
+    [[nodiscard]] session::DriverSnapShot getSnapShot(const std::shared_ptr<const Moment>& moment) const;
 
     // Sends the session, and with the turn the analytics bridge, what changed since the session's snapshot: simple
-    // values, histograms and states, each as one message, none where nothing changed.
-    void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) const;
+    // values, histograms and states, each as one message, none where nothing changed. The moment is that of the
+    // session's end.
+    void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session,
+                                  const std::shared_ptr<const Moment>& moment) const;
 
     // Each adds one channel of a difference of samples, if it has something to report.
     static void processSimpleData(const platform::ReportingChannel& channel, DriverStats& driverStats);
@@ -43,7 +50,7 @@ public:
                                                        std::string_view type);
 
 private:
-    void subscribe(KestoReportingDriver driver);
+    void subscribe(KestoReportingDriver driver, const Moment& moment);
 
     std::vector<KestoReportingIOChannelSubscription> ioChannelSubscriptions_;
 };

@@ -45,10 +45,13 @@ public:
     [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
     [[nodiscard]] Sessions getAllActiveReportingSessions() override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
-    [[nodiscard]] session::DriverSnapShot getSnapShot() override { return driverUtility_->getSnapShot(); }
+    [[nodiscard]] session::DriverSnapShot getSnapShot() override
+    {
+        return driverUtility_->getSnapShot(driverUtility_->readMoment());
+    }
     void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) override
     {
-        driverUtility_->sendDriverLogsForSession(turn, session);
+        driverUtility_->sendDriverLogsForSession(turn, session, driverUtility_->readMoment());
     }
     void handleEventForVorp(const foundation::Dictionary& message, AudioEventCategory category, std::uint16_t type,
                             const std::shared_ptr<KestoReportingSession>& session,

@@ -38,14 +38,14 @@ protected:
     {
         utility.emplace();
         session->start();
-        session->setDriverSnapShot(utility->getSnapShot());
+        session->setDriverSnapShot(utility->getSnapShot(utility->readMoment()));
         fakes.log.clear();
     }
     // The event of that kind at the session's end, key by key.
     std::map<std::string, std::string> end(const std::string& kind)
     {
         fakes.analytics.clear();
-        utility->sendDriverLogsForSession(fakes.turn, session);
+        utility->sendDriverLogsForSession(fakes.turn, session, utility->readMoment());
         std::map<std::string, std::string> statistics;
         for (const Dictionary& payload : fakes.analytics.payloads("com.quarn.kesto.Cavlet." + kind))
             for (const auto& [key, value] : payload)

@@ -259,7 +259,7 @@ protected:
     {
         utility.emplace();
         session->start();
-        session->setDriverSnapShot(utility->getSnapShot());
+        session->setDriverSnapShot(utility->getSnapShot(utility->readMoment()));
         forget();
     }
     void forget()
@@ -270,7 +270,7 @@ protected:
     // The session's messages, as "identifier: payload".
     std::vector<std::string> end()
     {
-        utility->sendDriverLogsForSession(platform.turn, session);
+        utility->sendDriverLogsForSession(platform.turn, session, utility->readMoment());
         std::vector<std::string> messages;
         for (const Dictionary& message : session->nestedAggregatedPayloadData().value_or(std::vector<Dictionary>()))
             for (const auto& [identifier, payload] : message)
