@@ -69,6 +69,10 @@ private:
         }
         [[nodiscard]] bool isFull() override { return false; }
         void setRoomHandler(std::function<void()>) override { }
+        [[nodiscard]] Resume pause() override
+        {
+            return [this](platform::TurnItem item) { submit(std::move(item)); };
+        }
         [[nodiscard]] bool isCurrent() const override { return true; }
     };
     class WorkQueues final : public platform::WorkQueues {

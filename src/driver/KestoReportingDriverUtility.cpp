@@ -17,13 +17,12 @@ std::string_view shown(const std::optional<std::string>& name)
     return name ? std::string_view(*name) : KestoReportingDriver::absentName;
 }
 
-// The channels of all these drivers.
 template <typename Drivers, typename DriverOf>
-std::shared_ptr<const platform::ReportingChannels::Moment> momentOf(const Drivers& drivers, DriverOf driverOf)
+std::vector<platform::ChannelSelection> selectionsOf(const Drivers& drivers, DriverOf driverOf)
 {
     std::vector<platform::ChannelSelection> selections;
     std::ranges::transform(drivers, std::back_inserter(selections), &KestoReportingDriver::selection, driverOf);
-    return platform::current().reportingChannels.readChannels(selections);
+    return selections;
 }
 
 } // namespace
@@ -39,12 +38,18 @@ KestoReportingDriverUtility::KestoReportingDriverUtility()
                                                     {"Rx", std::nullopt},
                                                     {"Tx", std::nullopt},
                                                     {std::nullopt, "HwAudio2"}};
-    const auto moment = momentOf(drivers, std::identity());
+    const auto moment = platform::current().reportingChannels.readChannels(selectionsOf(drivers, std::identity()));
     for (const KestoReportingDriver& driver : drivers)
         subscribe(driver, *moment);
+    if (!ioChannelSubscriptions_.empty())
+        moments_ = std::make_unique<driver::ChannelMoments>(
+            [of = selectionsOf(ioChannelSubscriptions_, &KestoReportingIOChannelSubscription::driver)] {
+                return platform::current().reportingChannels.readChannels(of);
+            });
 }
 
-void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver, const Moment& moment)
+void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver,
+                                            const platform::ReportingChannels::Moment& moment)
 {
     platform::ReportingChannels& service = platform::current().reportingChannels;
     const std::string_view group = shown(driver.groupName);
@@ -72,14 +77,7 @@ void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver, const M
     }
 }
 
-std::shared_ptr<const KestoReportingDriverUtility::Moment> KestoReportingDriverUtility::readMoment() const
-{
-    return ioChannelSubscriptions_.empty()
-        ? nullptr
-        : momentOf(ioChannelSubscriptions_, &KestoReportingIOChannelSubscription::driver);
-}
-
-session::DriverSnapShot KestoReportingDriverUtility::getSnapShot(const std::shared_ptr<const Moment>& moment) const
+session::DriverSnapShot KestoReportingDriverUtility::getSnapShot(const session::DriverMoment& moment) const
 {
     utility::assertServerQueue();
     session::DriverSnapShot snapShot;

@@ -85,7 +85,7 @@ void appendComponent(const std::optional<std::string>& component, std::string& k
 
 void KestoReportingDriverUtility::sendDriverLogsForSession(platform::Turn& turn,
                                                            const std::shared_ptr<KestoReportingSession>& session,
-                                                           const std::shared_ptr<const Moment>& moment) const
+                                                           const session::DriverMoment& moment) const
 {
     utility::assertServerQueue();
     DriverStatsByFormat stats;

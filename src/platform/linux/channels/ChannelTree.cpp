@@ -37,14 +37,15 @@ std::vector<std::string> LeftOutChannels::inWords(const ChannelTreeLimits& limit
     return lines;
 }
 
-std::expected<ChannelReading, std::error_code> ChannelTree::read(const std::vector<ChannelSelection>& selections) const
+std::expected<ChannelReading, std::error_code> ChannelTree::read(const std::vector<ChannelSelection>& selections,
+                                                                 const std::vector<std::string>& knownDrivers) const
 {
     const auto root = openFolder(AT_FDCWD, root_.c_str(), 0);
     if (!root && root.error() == ENOENT)
         return ChannelReading();
     if (!root)
         return std::unexpected(std::error_code(root.error(), std::generic_category()));
-    return ChannelWalk(root->get(), selections, limits_, now_).run();
+    return ChannelWalk(root->get(), selections, limits_, now_).run(knownDrivers);
 }
 
 } // namespace platform

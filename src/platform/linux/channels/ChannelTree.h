@@ -88,9 +88,10 @@ public:
     }
 
     // Reads the channels that any of the selections selects, in one walk. A missing root counts as empty; the error
-    // gives the reason if the root cannot be read.
+    // gives the reason if the root cannot be read. Drivers that are known from an earlier reading, ascending, are read
+    // even if a limit ends the search for drivers before it finds them.
     [[nodiscard]] std::expected<ChannelReading, std::error_code>
-    read(const std::vector<ChannelSelection>& selections) const;
+    read(const std::vector<ChannelSelection>& selections, const std::vector<std::string>& knownDrivers = {}) const;
 
 private:
     const std::filesystem::path root_;

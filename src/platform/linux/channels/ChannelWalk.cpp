@@ -63,9 +63,9 @@ ChannelWalk::ChannelWalk(DIR* root, const std::vector<ChannelSelection>& selecti
 {
 }
 
-ChannelReading ChannelWalk::run()
+ChannelReading ChannelWalk::run(const std::vector<std::string>& knownDrivers)
 {
-    findDrivers();
+    findDrivers(knownDrivers);
     letUsersTakeTurns();
     for (const auto& [number, user] : users_)
         if (user.isCut)
@@ -77,8 +77,10 @@ ChannelReading ChannelWalk::run()
     return std::move(reading_);
 }
 
-void ChannelWalk::findDrivers()
+void ChannelWalk::findDrivers(const std::vector<std::string>& known)
 {
+    for (const std::string& driver : known)
+        addDriver(driver.c_str());
     for (std::size_t count = 0; const dirent* entry = ::readdir(root_); ++count) {
         const bool isTimeOver =
             count % namesBetweenLooksAtTheTime == 0 && timeTaken() > limits_.time / partForFindingDrivers;
@@ -87,9 +89,11 @@ void ChannelWalk::findDrivers()
             reading_.isWhole = false;
             break;
         }
-        if (entry->d_name[0] != '.' && mayBeFolder(entry->d_type))
+        if (entry->d_name[0] == '.' || std::ranges::binary_search(known, std::string_view(entry->d_name)))
+            continue;
+        if (mayBeFolder(entry->d_type))
             addDriver(entry->d_name);
-        else if (entry->d_name[0] != '.' && !foundation::isValidUtf8(entry->d_name))
+        else if (!foundation::isValidUtf8(entry->d_name))
             fail(entry->d_name, "its name is not UTF-8");
     }
     for (auto& [number, user] : users_)
@@ -101,7 +105,7 @@ void ChannelWalk::addDriver(const char* name)
     if (!foundation::isValidUtf8(name))
         return fail(name, "its name is not UTF-8");
     struct stat status = {};
-    if (::fstatat(::dirfd(root_), name, &status, AT_SYMLINK_NOFOLLOW) != 0) {
+    if (::fstatat(descriptorOf(root_), name, &status, AT_SYMLINK_NOFOLLOW) != 0) {
         if (errno != ENOENT)
             fail(name, systemErrorText(errno));
         return;
@@ -258,7 +262,7 @@ std::optional<std::string_view> ChannelWalk::readFile(DIR* folder, const SharedP
         return std::nullopt;
     };
     const FileDescriptor file(
-        ::openat(::dirfd(folder), entry.name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
+        ::openat(descriptorOf(folder), entry.name.c_str(), O_RDONLY | O_NOFOLLOW | O_NONBLOCK | O_NOCTTY | O_CLOEXEC));
     if (file && entry.type == DT_UNKNOWN && !isRegular(file.get()))
         return failed("it is not a regular file");
     // One call reads the whole file, because publishers replace files and never change them.
@@ -274,7 +278,7 @@ bool ChannelWalk::isGone(const SharedPlace& driver, std::string_view owner, User
 {
     if (user.owner.driver != driver || user.owner.owner != owner) {
         const auto folder = folders_.open(driver);
-        user.owner = {driver, std::string(owner), folder && isChannelOwnerGone(::dirfd(*folder), owner)};
+        user.owner = {driver, std::string(owner), folder && isChannelOwnerGone(descriptorOf(*folder), owner)};
     }
     return user.owner.isGone;
 }

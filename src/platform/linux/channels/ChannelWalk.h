@@ -23,8 +23,8 @@ public:
     ChannelWalk(DIR* root, const std::vector<ChannelSelection>& selections, const ChannelTreeLimits& limits,
                 const ChannelTree::Now& now);
 
-    // Call it once.
-    [[nodiscard]] ChannelReading run();
+    // Call it once. The drivers are ascending.
+    [[nodiscard]] ChannelReading run(const std::vector<std::string>& knownDrivers);
 
 private:
     struct Entry {
@@ -52,7 +52,7 @@ private:
     };
     using LeftOut = std::size_t LeftOutChannels::*;
 
-    void findDrivers();
+    void findDrivers(const std::vector<std::string>& known);
     void addDriver(const char* name);
     void forgetLastDrivers(User& user);
     void letUsersTakeTurns();

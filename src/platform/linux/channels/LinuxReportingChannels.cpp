@@ -44,14 +44,31 @@ LinuxReportingChannels::readChannels(const std::vector<ChannelSelection>& select
 {
     const auto moment = std::make_shared<Reading>();
     moment->ofSoundCards = soundCards_.read(selections);
-    if (auto reading = tree_.read(selections)) {
+    if (auto reading = tree_.read(selections, knownDrivers())) {
         complaints_.report(*reading);
+        rememberDrivers(reading->channels);
         moment->ofTree = {std::move(reading->channels), reading->isWhole, std::move(reading->cutUsers)};
     } else {
         moment->error = reading.error();
         moment->ofTree.isWhole = false;
     }
     return moment;
+}
+
+std::vector<std::string> LinuxReportingChannels::knownDrivers() const
+{
+    const foundation::Lock lock(lock_);
+    return knownDrivers_;
+}
+
+void LinuxReportingChannels::rememberDrivers(const std::vector<ReportingChannel>& channels)
+{
+    std::vector<std::string> drivers;
+    for (const ReportingChannel& channel : channels) // in the order of their drivers
+        if (drivers.empty() || drivers.back() != *channel.driver)
+            drivers.push_back(*channel.driver);
+    const foundation::Lock lock(lock_);
+    knownDrivers_ = std::move(drivers);
 }
 
 ReportingChannels::FoundChannels LinuxReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group,

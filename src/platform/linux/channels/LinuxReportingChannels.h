@@ -8,6 +8,7 @@
 // moment, so channels may come and go.
 #pragma once
 
+#include "foundation/Mutex.h"
 #include "platform/linux/channels/ChannelComplaints.h"
 #include "platform/linux/channels/ChannelTree.h"
 #include "platform/linux/channels/SoundCards.h"
@@ -44,9 +45,16 @@ private:
     struct Selection;
     struct Reading;
 
+    [[nodiscard]] std::vector<std::string> knownDrivers() const;
+    void rememberDrivers(const std::vector<ReportingChannel>& channels);
+
     const ChannelTree tree_;
     const SoundCards soundCards_;
     ChannelComplaints complaints_;
+    mutable foundation::Mutex lock_;
+    // Those that had channels when the tree was read last, ascending. A user who fills the root with folders does not
+    // keep them out.
+    std::vector<std::string> knownDrivers_ KESTO_GUARDED_BY(lock_);
 };
 
 } // namespace platform

@@ -20,6 +20,11 @@ std::expected<OpenFolder, int> openFolder(int parent, const char* name, int link
     return std::unexpected(error);
 }
 
+int descriptorOf(DIR* folder) noexcept
+{
+    return ::dirfd(folder);
+}
+
 std::expected<DIR*, int> OpenFolders::open(const SharedPlace& place)
 {
     if (open_.size() > place->depth && open_[place->depth].first == place)
@@ -27,7 +32,7 @@ std::expected<DIR*, int> OpenFolders::open(const SharedPlace& place)
     const auto parent = place->parent ? open(place->parent) : root_;
     if (!parent)
         return parent;
-    auto folder = openFolder(::dirfd(*parent), place->name.c_str(), O_NOFOLLOW);
+    auto folder = openFolder(descriptorOf(*parent), place->name.c_str(), O_NOFOLLOW);
     open_.resize(place->depth);
     if (!folder)
         return std::unexpected(folder.error());

@@ -20,6 +20,9 @@ using OpenFolder = std::unique_ptr<DIR, CloseFolder>;
 // Opens a folder; on failure returns `errno`. With O_NOFOLLOW it does not follow a link. Any thread.
 [[nodiscard]] std::expected<OpenFolder, int> openFolder(int parent, const char* name, int linkFlag);
 
+// Its descriptor, which stays the folder's. Any thread.
+[[nodiscard]] int descriptorOf(DIR* folder) noexcept;
+
 // The place of a folder below the root.
 struct FolderPlace {
     std::shared_ptr<const FolderPlace> parent; // null: the root

@@ -243,6 +243,29 @@ TEST_F(LinuxReportingChannelsTest, AreAnErrorWhereTheTreeCannotBeReadAndNoSoundC
         ENOTDIR);
 }
 
+TEST_F(LinuxReportingChannelsTest, OfKnownDriversAreReadHoweverManyFoldersCameMeanwhile)
+{
+    const auto publishOf = [&](const std::string& driver) { publish(driver + "/Tx/-/" + driver, "simple\n1\n"); };
+    const std::vector<std::string> known{"a", "b", "c", "d", "e"};
+    std::ranges::for_each(known, publishOf);
+    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.drivers = known.size() + 2});
+    const auto subscribed = bounded.createSubscription(*find(bounded, "Tx", std::nullopt).channels);
+    for (int other = 0; other < 50; ++other)
+        publishOf("other " + std::to_string(other));
+    const auto values = valuesOf(
+        bounded.createSamples(*subscribed.subscription, *subscribed.channels, *bounded.readChannels(all)).value());
+    for (const std::string& driver : known)
+        EXPECT_THAT(values, testing::Contains(Pair(driver, 1)));
+    EXPECT_LT(values.size(), 50U) << "the bound was met";
+    publish("a/Tx/-/a", "simple\n2\n");
+    fs::remove_all(root / "b");
+    const auto later = valuesOf(
+        bounded.createSamples(*subscribed.subscription, *subscribed.channels, *bounded.readChannels(all)).value());
+    EXPECT_EQ(later.at("a"), 2);
+    EXPECT_THAT(later, testing::Not(testing::Contains(testing::Key("b"))));
+    EXPECT_THAT(log.lines("kerl"), SizeIs(1)) << "of the bound";
+}
+
 // Then its absence from the first sample proves nothing: its content may be older.
 TEST_F(LinuxReportingChannelsTest, ThatTheFirstSampleCouldNotSeeHaveNoDifference)
 {
