@@ -24,6 +24,7 @@ namespace {
 namespace fs = std::filesystem;
 
 constexpr std::size_t channelCount = 1000;
+const std::vector<platform::ChannelSelection> speaker{{"Speaker", std::nullopt}};
 
 // A temporary directory in the usual, in-memory place of channels, if that exists.
 class ChannelRoot {
@@ -88,7 +89,8 @@ double costOfSample(platform::LinuxReportingChannels& channels, const platform::
     constexpr std::size_t times = 10;
     return nanosecondsEach(times,
                            [&](std::size_t) {
-                               const auto sample = channels.createSamples(*of.subscription, *of.channels);
+                               const auto sample = channels.createSamples(*of.subscription, *of.channels,
+                                                                          *channels.readChannels(speaker));
                                if (!sample || sample->channels.size() != channelCount)
                                    throw std::runtime_error("not all channels were sampled");
                                use(*sample);
@@ -138,9 +140,12 @@ void measureSampling(const BenchOptions& options, Report& report)
     platform::LinuxReportingChannels channels(root.path(), "/nowhere", platform::current().ledger,
                                               platform::ProviderLog(platform::current().log));
     publishAll(root.path(), 1);
-    const auto subscribed =
-        channels.createSubscription(*channels.copyChannelsInGroup("Speaker", std::nullopt).channels);
-    const auto sample = [&] { return channels.createSamples(*subscribed.subscription, *subscribed.channels).value(); };
+    const auto subscribed = channels.createSubscription(
+        *channels.copyChannelsInGroup("Speaker", std::nullopt, *channels.readChannels(speaker)).channels);
+    const auto sample = [&] {
+        return channels.createSamples(*subscribed.subscription, *subscribed.channels, *channels.readChannels(speaker))
+            .value();
+    };
     const platform::ReportingSample before = sample();
     const auto files = publishAll(root.path(), 2);
     const platform::ReportingSample after = sample();

@@ -1,6 +1,6 @@
-// A channel tree as a hostile user makes it: 65,000 empty folders beside 4,096 channels. The service looks for groups
-// when it starts, and the well-behaved client starts a session, too; both see a small tree, in whose place the other
-// one comes when the flood starts.
+// A channel tree as a hostile user makes it: 65,000 empty folders beside 4,096 channels of another user. The service
+// looks for groups when it starts, and the well-behaved client starts a session, too; both see a small tree, in whose
+// place the other one comes when the flood starts.
 #pragma once
 
 #include "support/TemporaryDirectory.h"

@@ -69,6 +69,10 @@ private:
         }
         [[nodiscard]] bool isFull() override { return false; }
         void setRoomHandler(std::function<void()>) override { }
+        [[nodiscard]] Resume pause() override
+        {
+            return [this](platform::TurnItem item) { submit(std::move(item)); };
+        }
         [[nodiscard]] bool isCurrent() const override { return true; }
     };
     class WorkQueues final : public platform::WorkQueues {
@@ -151,7 +155,13 @@ private:
         void emit(std::uint32_t, const std::array<std::uint64_t, 4>&) override { }
     };
     class ReportingChannels final : public platform::ReportingChannels {
-        FoundChannels copyChannelsInGroup(std::optional<std::string_view>, std::optional<std::string_view>) override
+        [[nodiscard]] std::shared_ptr<const Moment>
+        readChannels(const std::vector<platform::ChannelSelection>&) override
+        {
+            return std::make_shared<Moment>();
+        }
+        FoundChannels copyChannelsInGroup(std::optional<std::string_view>, std::optional<std::string_view>,
+                                          const Moment&) override
         {
             return {};
         }
@@ -161,7 +171,7 @@ private:
             return {.subscription = nullptr, .channels = nullptr, .error = unavailable};
         }
         std::expected<platform::ReportingSample, platform::ReportingChannelError>
-        createSamples(const Subscription&, const ChannelSet&) override
+        createSamples(const Subscription&, const ChannelSet&, const Moment&) override
         {
             return std::unexpected(unavailable);
         }

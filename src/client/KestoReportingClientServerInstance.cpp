@@ -216,16 +216,23 @@ void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t
         const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false);
         if (!session || session->started() || !delegate)
             return reply(turn, std::nullopt, true);
-        start(turn, *delegate, session, reply);
+        self.withDriverMoment(turn, *delegate,
+                              [session, reply](auto& client, platform::Turn& later, const auto& moment) {
+                                  if (const auto service = client.delegate_.lock())
+                                      start(later, *service, session, moment, reply);
+                                  else
+                                      reply(later, std::nullopt, true);
+                              });
     });
 }
 
 void KestoReportingClientServerInstance::start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
-                                               const Session& session, const SuccessReply& reply)
+                                               const Session& session, const session::DriverMoment& moment,
+                                               const SuccessReply& reply)
 {
     session->start();
     turn.tally.add(Counter::SessionsStarted);
-    session->setDriverSnapShot(delegate.getSnapShot());
+    session->setDriverSnapShot(delegate.getSnapShot(moment));
     if (const auto& earlier = session->transactionCompleteBlock())
         earlier(turn, std::nullopt, true);
     session->setTransactionCompleteBlock(reply);
@@ -245,17 +252,25 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
             return reply(turn, std::nullopt, true);
         const auto session = self.findReportingSessionForID(reporterID, false);
         const auto delegate = self.delegate_.lock();
-        if (session && session->started() && delegate)
-            stop(turn, *delegate, session);
-        KESTO_LOG(KestoReportingClientCategory(), Default, "stopping {}", reporterID);
-        reply(turn, std::nullopt, true);
+        const auto finish = [reporterID, reply](platform::Turn& last) {
+            KESTO_LOG(KestoReportingClientCategory(), Default, "stopping {}", reporterID);
+            reply(last, std::nullopt, true);
+        };
+        if (!session || !session->started() || !delegate)
+            return finish(turn);
+        self.withDriverMoment(turn, *delegate,
+                              [session, finish](auto& client, platform::Turn& later, const auto& moment) {
+                                  if (const auto service = client.delegate_.lock())
+                                      stop(later, *service, session, moment);
+                                  finish(later);
+                              });
     });
 }
 
 void KestoReportingClientServerInstance::stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
-                                              const Session& session)
+                                              const Session& session, const session::DriverMoment& moment)
 {
-    delegate.sendDriverLogsForSession(turn, session);
+    delegate.sendDriverLogsForSession(turn, session, moment);
     session->setDriverSnapShot(std::nullopt);
     session->stop(turn);
     if (const auto& complete = session->transactionCompleteBlock())

@@ -100,9 +100,25 @@ private:
         queue_->submitLong(
             [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
     }
+    // Runs `work(*this, turn, moment)` with the drivers' channels, which are read now. It runs at once if there are
+    // none to read; otherwise later, and this client's next calls wait for it. For an item of `submitLong`, as its last
+    // step.
+    template <typename Work>
+    void withDriverMoment(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Work work)
+    {
+        if (!delegate.needsDriverMoments())
+            return work(*this, turn, nullptr);
+        delegate.readDriverMoment([self = shared_from_this(), work = std::move(work),
+                                   resume = queue_->pause()](session::DriverMoment moment) mutable {
+            resume([self = std::move(self), work = std::move(work), moment = std::move(moment)](platform::Turn& later) {
+                work(*self, later, moment);
+            });
+        });
+    }
     static void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
-                      const SuccessReply& reply);
-    static void stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session);
+                      const session::DriverMoment& moment, const SuccessReply& reply);
+    static void stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
+                     const session::DriverMoment& moment);
     void deliverToReporters(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
                             const Message& message, const ReporterIDs& reporterIDs);
     void deliverToActiveSessions(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,

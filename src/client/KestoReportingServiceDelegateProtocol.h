@@ -5,6 +5,7 @@
 #include "session/KestoReportingSession.h"
 
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -31,11 +32,15 @@ public:
     [[nodiscard]] virtual Sessions getAllActiveReportingSessions() = 0;
     // The session of that ID that belongs to the client registered first, or null.
     [[nodiscard]] virtual std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) = 0;
+    // Whether the next two need the drivers' channels, which `readDriverMoment` reads on another thread and gives to
+    // `take` there; otherwise they get null.
+    [[nodiscard]] virtual bool needsDriverMoments() const = 0;
+    virtual void readDriverMoment(std::move_only_function<void(session::DriverMoment moment)> take) = 0;
     // A sample of all audio drivers, by driver.
-    [[nodiscard]] virtual session::DriverSnapShot getSnapShot() = 0;
+    [[nodiscard]] virtual session::DriverSnapShot getSnapShot(const session::DriverMoment& moment) = 0;
     // Reports to the session how the drivers' channels changed since the session's snapshot.
-    virtual void sendDriverLogsForSession(platform::Turn& turn,
-                                          const std::shared_ptr<KestoReportingSession>& session) = 0;
+    virtual void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session,
+                                          const session::DriverMoment& moment) = 0;
     virtual void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) = 0;
     // Offers the message to the bug-capture manager, which exists only on internal builds, with the process that sent
     // it.

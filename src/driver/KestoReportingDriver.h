@@ -1,6 +1,8 @@
 // One group of driver channels to subscribe to.
 #pragma once
 
+#include "platform/ReportingChannels.h"
+
 #include <optional>
 #include <string>
 #include <string_view>
@@ -12,6 +14,7 @@ struct KestoReportingDriver {
     // The text for an absent name, in keys and in the log.
     static constexpr std::string_view absentName = "(null)";
 
+    [[nodiscard]] platform::ChannelSelection selection() const { return {groupName, subGroupName}; }
     // "group-subgroup"; the key of this driver in snapshots.
     [[nodiscard]] std::string description() const
     {

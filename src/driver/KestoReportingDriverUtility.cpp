@@ -5,6 +5,11 @@
 #include "utility/KestoReportingUtility.h"
 #include "utility/ServerQueue.h"
 
+#include <algorithm>
+#include <functional>
+#include <iterator>
+#include <utility>
+
 namespace {
 
 std::string_view shown(const std::optional<std::string>& name)
@@ -12,28 +17,45 @@ std::string_view shown(const std::optional<std::string>& name)
     return name ? std::string_view(*name) : KestoReportingDriver::absentName;
 }
 
+template <typename Drivers, typename DriverOf>
+std::vector<platform::ChannelSelection> selectionsOf(const Drivers& drivers, DriverOf driverOf)
+{
+    std::vector<platform::ChannelSelection> selections;
+    std::ranges::transform(drivers, std::back_inserter(selections), &KestoReportingDriver::selection, driverOf);
+    return selections;
+}
+
 } // namespace
 
 KestoReportingDriverUtility::KestoReportingDriverUtility()
 {
     KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "creating cavlet driver utility");
-    subscribe({"QuarnZT4", std::nullopt});
-    subscribe({"Speaker", std::nullopt});
-    subscribe({std::nullopt, "MCA"});
-    subscribe({"Haptics", "Stats"});
-    subscribe({"StateTransitionTimes_ms", std::nullopt});
-    subscribe({"Rx", std::nullopt});
-    subscribe({"Tx", std::nullopt});
-    subscribe({std::nullopt, "HwAudio2"});
+    const std::vector<KestoReportingDriver> drivers{{"QuarnZT4", std::nullopt},
+                                                    {"Speaker", std::nullopt},
+                                                    {std::nullopt, "MCA"},
+                                                    {"Haptics", "Stats"},
+                                                    {"StateTransitionTimes_ms", std::nullopt},
+                                                    {"Rx", std::nullopt},
+                                                    {"Tx", std::nullopt},
+                                                    {std::nullopt, "HwAudio2"}};
+    const auto moment = platform::current().reportingChannels.readChannels(selectionsOf(drivers, std::identity()));
+    for (const KestoReportingDriver& driver : drivers)
+        subscribe(driver, *moment);
+    if (!ioChannelSubscriptions_.empty())
+        moments_ = std::make_unique<driver::ChannelMoments>(
+            [of = selectionsOf(ioChannelSubscriptions_, &KestoReportingIOChannelSubscription::driver)] {
+                return platform::current().reportingChannels.readChannels(of);
+            });
 }
 
-void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver)
+void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver,
+                                            const platform::ReportingChannels::Moment& moment)
 {
     platform::ReportingChannels& service = platform::current().reportingChannels;
     const std::string_view group = shown(driver.groupName);
     const std::string_view subgroup = shown(driver.subGroupName);
 
-    const auto found = service.copyChannelsInGroup(driver.groupName, driver.subGroupName);
+    const auto found = service.copyChannelsInGroup(driver.groupName, driver.subGroupName, moment);
     if (found.error)
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Error, "error {} getting channels for driver {}-{}",
                   *found.error, group, subgroup);
@@ -55,13 +77,13 @@ void KestoReportingDriverUtility::subscribe(KestoReportingDriver driver)
     }
 }
 
-session::DriverSnapShot KestoReportingDriverUtility::getSnapShot() const
+session::DriverSnapShot KestoReportingDriverUtility::getSnapShot(const session::DriverMoment& moment) const
 {
     utility::assertServerQueue();
     session::DriverSnapShot snapShot;
     for (const auto& [driver, subscription, channels] : ioChannelSubscriptions_) {
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "sampling driver {}", driver.description());
-        auto sample = platform::current().reportingChannels.createSamples(*subscription, *channels);
+        auto sample = platform::current().reportingChannels.createSamples(*subscription, *channels, *moment);
         if (sample)
             snapShot.insert_or_assign(driver.description(), *std::move(sample));
         else

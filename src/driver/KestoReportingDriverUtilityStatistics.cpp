@@ -84,13 +84,14 @@ void appendComponent(const std::optional<std::string>& component, std::string& k
 } // namespace
 
 void KestoReportingDriverUtility::sendDriverLogsForSession(platform::Turn& turn,
-                                                           const std::shared_ptr<KestoReportingSession>& session) const
+                                                           const std::shared_ptr<KestoReportingSession>& session,
+                                                           const session::DriverMoment& moment) const
 {
     utility::assertServerQueue();
     DriverStatsByFormat stats;
     for (const auto& [driver, subscription, channels] : ioChannelSubscriptions_) {
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "getting latest samples");
-        const auto sample = platform::current().reportingChannels.createSamples(*subscription, *channels);
+        const auto sample = platform::current().reportingChannels.createSamples(*subscription, *channels, *moment);
         KESTO_LOG(KestoReportingDriverUtilityCategory(), Info, "done getting latest samples");
         if (!sample) {
             KESTO_LOG(KestoReportingDriverUtilityCategory(), Error, "creating samples of driver {}: error {}",

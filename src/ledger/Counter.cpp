@@ -98,7 +98,7 @@ constexpr std::array<CounterRow, counterCount> makeRows()
         {SummariesLost, "sessions.lost.summaries", Loss, "no memory was left for a session's summary",
          "stop sessions from time to time, or send less"},
 
-        {ChannelsLeftOut, "channels.leftOut", Limit, "channels were too many, too large or not readable",
+        {ChannelsLeftOut, "channels.leftOut", Limit, "channels were too many, too large, too late or not readable",
          "look for their names in the service's log"},
         {CapturesTaken, "captures.taken", Work, "", ""},
         {CapturesFailed, "captures.failed", Loss, "a bug capture could not be written",

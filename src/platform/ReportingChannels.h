@@ -38,6 +38,7 @@ struct ReportingChannel {
     std::optional<std::string> subgroup;
     std::optional<std::string> name;
     std::optional<std::string> unit;
+    std::uint32_t user = 0; // who publishes it
     std::int64_t value = 0;
     std::int64_t minimum = 0;
     std::int64_t maximum = 0;
@@ -49,14 +50,22 @@ struct ReportingSample {
     std::vector<ReportingChannel> channels;
     // Whether all requested channels could be read. If not, an existing channel may be missing.
     bool isWhole = true;
+    // The users of whom an existing channel may be missing although the sample is whole for all others; ascending.
+    std::vector<std::uint32_t> cutUsers = {};
+};
+
+// Selects channels; an absent name means any.
+struct ChannelSelection {
+    std::optional<std::string> group;
+    std::optional<std::string> subgroup;
 };
 
 using ReportingChannelError = std::int64_t; // the platform's error code
 
-// If the platform returns a result and an error together, these functions return both.
+// Channels are read for all groups together, because one publisher has channels in several: `readChannels` reads them,
+// and everything else works with what it read. Only `readChannels` may wait for the disk.
 //
-// One thread at a time for each set of channels; otherwise any thread. Functions that look for channels or sample them
-// may wait for the disk.
+// If the platform returns a result and an error together, these functions return both. Any thread.
 class ReportingChannels {
 public:
     // The platform's own data of a set of channels or a subscription.
@@ -79,16 +88,26 @@ public:
         std::optional<ReportingChannelError> error;
     };
 
+    // What the selected channels held at one moment; it does not change.
+    class Moment {
+    public:
+        virtual ~Moment() = default;
+    };
+
     virtual ~ReportingChannels() = default;
-    // An absent group or subgroup means any. Without publishers it returns an empty set or none, and no error.
+    // Reads the channels that any of the selections selects.
+    [[nodiscard]] virtual std::shared_ptr<const Moment>
+    readChannels(const std::vector<ChannelSelection>& selections) = 0;
+    // An absent group or subgroup means any. Without publishers it returns an empty set or none, and no error. The
+    // moment must have been read for this group.
     virtual FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
-                                              std::optional<std::string_view> subgroup) = 0;
+                                              std::optional<std::string_view> subgroup, const Moment& moment) = 0;
     // The number of channels when the set was made.
     [[nodiscard]] virtual std::size_t channelCount(const ChannelSet& channels) const = 0;
     virtual Subscribed createSubscription(const ChannelSet& channels) = 0;
-    // The present channels of the group and subgroup, including those that came after the subscription.
-    virtual std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
-                                                                                const ChannelSet& channels) = 0;
+    // The channels that the group and subgroup had at that moment, including those that came after the subscription.
+    virtual std::expected<ReportingSample, ReportingChannelError>
+    createSamples(const Subscription& subscription, const ChannelSet& channels, const Moment& moment) = 0;
     // The increase of each channel's counters up to the later sample; a new or restarted channel counts with its whole
     // content. Extremes are those of the later sample, and a duty cycle is the share of the difference.
     virtual std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,

@@ -71,6 +71,13 @@ public:
     [[nodiscard]] virtual bool isFull() = 0;
     // The thread that runs the items calls the handler. Set it before `isFull` is called.
     virtual void setRoomHandler(std::function<void()> handler) = 0;
+
+    // Continues a lane that pauses: its next item is this one, as by `submitLong`. Any thread.
+    using Resume = std::move_only_function<void(TurnItem item)>;
+    // For an item that needs something that takes long and is made elsewhere: until the result is called, no item of
+    // this lane runs, while those of other lanes do. Only an item of this lane may call it, submitted by `submitLong`,
+    // and once. The result must be called: a queue that ends waits for it.
+    [[nodiscard]] virtual Resume pause() = 0;
 };
 
 // How a serial queue is run.

@@ -14,6 +14,7 @@
 #include <array>
 #include <atomic>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -45,10 +46,19 @@ public:
     [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
     [[nodiscard]] Sessions getAllActiveReportingSessions() override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
-    [[nodiscard]] session::DriverSnapShot getSnapShot() override { return driverUtility_->getSnapShot(); }
-    void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) override
+    [[nodiscard]] bool needsDriverMoments() const override { return driverUtility_->needsMoments(); }
+    void readDriverMoment(std::move_only_function<void(session::DriverMoment moment)> take) override
     {
-        driverUtility_->sendDriverLogsForSession(turn, session);
+        driverUtility_->readMoment(std::move(take));
+    }
+    [[nodiscard]] session::DriverSnapShot getSnapShot(const session::DriverMoment& moment) override
+    {
+        return driverUtility_->getSnapShot(moment);
+    }
+    void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session,
+                                  const session::DriverMoment& moment) override
+    {
+        driverUtility_->sendDriverLogsForSession(turn, session, moment);
     }
     void handleEventForVorp(const foundation::Dictionary& message, AudioEventCategory category, std::uint16_t type,
                             const std::shared_ptr<KestoReportingSession>& session,

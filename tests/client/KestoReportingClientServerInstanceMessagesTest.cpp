@@ -361,8 +361,11 @@ public:
     MOCK_METHOD(bool, isReportingEnabled, (), (const, override));
     MOCK_METHOD(Sessions, getAllActiveReportingSessions, (), (override));
     MOCK_METHOD(std::shared_ptr<KestoReportingSession>, findReportingSessionForID, (std::int64_t), (override));
-    MOCK_METHOD(session::DriverSnapShot, getSnapShot, (), (override));
-    MOCK_METHOD(void, sendDriverLogsForSession, (platform::Turn&, const std::shared_ptr<KestoReportingSession>&),
+    MOCK_METHOD(bool, needsDriverMoments, (), (const, override));
+    MOCK_METHOD(void, readDriverMoment, (std::move_only_function<void(session::DriverMoment)>), (override));
+    MOCK_METHOD(session::DriverSnapShot, getSnapShot, (const session::DriverMoment&), (override));
+    MOCK_METHOD(void, sendDriverLogsForSession,
+                (platform::Turn&, const std::shared_ptr<KestoReportingSession>&, const session::DriverMoment&),
                 (override));
     MOCK_METHOD(void, removeClient, (const std::shared_ptr<KestoReportingClientServerInstance>&), (override));
     MOCK_METHOD(void, handleEventForVorp,
@@ -547,7 +550,7 @@ TEST_F(ClientAndServiceTest, StopsInOrder)
     platform.workQueues.runAll();
 
     const testing::InSequence inOrder;
-    EXPECT_CALL(*service, sendDriverLogsForSession(_, session(42))).WillOnce([](auto&, const auto& stopping) {
+    EXPECT_CALL(*service, sendDriverLogsForSession(_, session(42), _)).WillOnce([](auto&, const auto& stopping, auto&) {
         EXPECT_TRUE(stopping->started());
         EXPECT_NE(stopping->driverSnapShot(), std::nullopt);
     });
@@ -562,6 +565,106 @@ TEST_F(ClientAndServiceTest, StopsInOrder)
     EXPECT_CALL(stopAnswer, Call);
     client->stopReportingSessionForID(42, [&](auto&, const auto&, bool) { stopAnswer.Call(); });
     platform.workQueues.runAll();
+}
+
+// Another thread reads the drivers' channels; the test is that thread.
+class DriverChannelsTest : public ClientAndServiceTest {
+protected:
+    using Moment = platform::ReportingChannels::Moment;
+
+    DriverChannelsTest()
+    {
+        createSession(42);
+        createSession(43);
+        ON_CALL(*service, needsDriverMoments).WillByDefault(Return(true));
+        ON_CALL(*service, readDriverMoment).WillByDefault([this](auto take) { asked.push_back(std::move(take)); });
+    }
+    void start(std::int64_t reporterID)
+    {
+        client->startReportingSessionForID(reporterID, [](auto&, const auto&, bool) { });
+        platform.workQueues.runAll();
+    }
+    // The channels that were asked for first have been read.
+    void answer()
+    {
+        auto take = std::move(asked.front());
+        asked.erase(asked.begin());
+        take(moment);
+        platform.workQueues.runAll();
+    }
+
+    const session::DriverMoment moment = std::make_shared<Moment>();
+    std::vector<std::move_only_function<void(session::DriverMoment)>> asked;
+};
+
+TEST_F(DriverChannelsTest, AreReadBeforeASessionStarts)
+{
+    start(42);
+    ASSERT_THAT(asked, SizeIs(1));
+    EXPECT_FALSE(session(42)->started());
+    EXPECT_CALL(*service, getSnapShot(moment)).WillOnce(Return(session::DriverSnapShot{{"Rx-(null)", {}}}));
+    answer();
+    EXPECT_TRUE(session(42)->started());
+    EXPECT_EQ(session(42)->driverSnapShot()->begin()->first, "Rx-(null)");
+}
+
+TEST_F(DriverChannelsTest, AreReadBeforeASessionStops)
+{
+    start(42);
+    answer();
+    int answers = 0;
+    client->stopReportingSessionForID(42, [&](auto&, const auto&, bool) { ++answers; });
+    platform.workQueues.runAll();
+    EXPECT_TRUE(session(42)->started());
+    EXPECT_EQ(answers, 0);
+    EXPECT_CALL(*service, sendDriverLogsForSession(_, session(42), moment));
+    answer();
+    EXPECT_FALSE(session(42)->started());
+    EXPECT_EQ(answers, 1);
+}
+
+TEST_F(DriverChannelsTest, HoldUpTheClientsNextCallsInTheirOrder)
+{
+    std::vector<std::string> done;
+    start(42);
+    client->setServiceType(3, 42, [&](auto&, const auto&, bool) {
+        done.emplace_back(session(42)->started() ? "set when started" : "set before");
+    });
+    client->stopReportingSessionForID(42, [&](auto&, const auto&, bool) { done.emplace_back("stopped"); });
+    client->setServiceType(4, 42, [&](auto&, const auto&, bool) {
+        done.emplace_back(session(42)->started() ? "set before" : "set when stopped");
+    });
+    platform.workQueues.runAll();
+    EXPECT_THAT(done, IsEmpty());
+    answer();
+    EXPECT_THAT(done, ElementsAre("set when started"));
+    answer();
+    EXPECT_THAT(done, ElementsAre("set when started", "stopped", "set when stopped"));
+}
+
+TEST_F(DriverChannelsTest, AreNotReadForACallThatChangesNothing)
+{
+    start(0);
+    start(44);
+    start(42);
+    answer();
+    start(42);
+    for (const std::int64_t reporterID : {0, 43, 44})
+        client->stopReportingSessionForID(reporterID, [](auto&, const auto&, bool) { });
+    platform.workQueues.runAll();
+    EXPECT_THAT(asked, IsEmpty());
+}
+
+TEST_F(DriverChannelsTest, DoNotKeepALostClientFromGoing)
+{
+    const KestoReportingServiceDelegateProtocol::Clients clients{client};
+    ON_CALL(*service, getAllClients).WillByDefault(testing::ReturnRef(clients));
+    start(42);
+    client->handleConnectionError();
+    platform.workQueues.runAll();
+    EXPECT_CALL(*service, removeClient(client));
+    answer();
+    EXPECT_EQ(client->clientReportingSessionMap().size(), 0U);
 }
 
 TEST_F(ClientAndServiceTest, SendsNoDriverLogsForASessionThatIsDestroyedOrLost)

@@ -2,6 +2,7 @@
 // files in between.
 #include "driver/KestoReportingDriverUtility.h"
 #include "platform/linux/channels/LinuxReportingChannels.h"
+#include "support/DriverMoment.h"
 #include "support/ExchangedProviders.h"
 #include "support/TemporaryDirectory.h"
 #include "support/TestPlatform.h"
@@ -38,14 +39,14 @@ protected:
     {
         utility.emplace();
         session->start();
-        session->setDriverSnapShot(utility->getSnapShot());
+        session->setDriverSnapShot(utility->getSnapShot(support::driverMoment(*utility, fakes)));
         fakes.log.clear();
     }
     // The event of that kind at the session's end, key by key.
     std::map<std::string, std::string> end(const std::string& kind)
     {
         fakes.analytics.clear();
-        utility->sendDriverLogsForSession(fakes.turn, session);
+        utility->sendDriverLogsForSession(fakes.turn, session, support::driverMoment(*utility, fakes));
         std::map<std::string, std::string> statistics;
         for (const Dictionary& payload : fakes.analytics.payloads("com.quarn.kesto.Cavlet." + kind))
             for (const auto& [key, value] : payload)

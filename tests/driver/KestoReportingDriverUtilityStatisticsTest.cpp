@@ -1,5 +1,6 @@
 // How the drivers' channels changed during a session, as text, and which services get the text.
 #include "driver/KestoReportingDriverUtility.h"
+#include "support/DriverMoment.h"
 #include "support/TestPlatform.h"
 
 #include <gmock/gmock.h>
@@ -259,7 +260,7 @@ protected:
     {
         utility.emplace();
         session->start();
-        session->setDriverSnapShot(utility->getSnapShot());
+        session->setDriverSnapShot(utility->getSnapShot(support::driverMoment(*utility, platform)));
         forget();
     }
     void forget()
@@ -270,7 +271,7 @@ protected:
     // The session's messages, as "identifier: payload".
     std::vector<std::string> end()
     {
-        utility->sendDriverLogsForSession(platform.turn, session);
+        utility->sendDriverLogsForSession(platform.turn, session, support::driverMoment(*utility, platform));
         std::vector<std::string> messages;
         for (const Dictionary& message : session->nestedAggregatedPayloadData().value_or(std::vector<Dictionary>()))
             for (const auto& [identifier, payload] : message)

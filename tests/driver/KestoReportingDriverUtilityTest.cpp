@@ -1,6 +1,6 @@
 // Subscribing to the eight driver groups, and snapshots of them.
 #include "driver/KestoReportingDriverUtility.h"
-#include "support/TestPlatform.h"
+#include "support/DriverMoment.h"
 
 #include <gmock/gmock.h>
 
@@ -8,6 +8,7 @@ namespace {
 
 using enum platform::LogLevel;
 using platform::ReportingChannel;
+using support::driverMoment;
 using support::IsLine;
 using testing::Contains;
 using testing::ElementsAre;
@@ -74,6 +75,63 @@ TEST_F(DriverUtility, AsksForTheEightDriversInTheOrderOfTheTable)
                             Pair(Name("Rx"), Name()), Pair(Name("Tx"), Name()), Pair(Name(), Name("HwAudio2"))));
 }
 
+TEST_F(DriverUtility, ReadsTheChannelsOfAllDriversAtOnce)
+{
+    publishAll();
+    const KestoReportingDriverUtility utility;
+    EXPECT_EQ(channels.readings(), 1U);
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), SizeIs(8));
+    EXPECT_EQ(channels.readings(), 2U);
+}
+
+TEST_F(DriverUtility, NeedsNoMomentAndNoThreadWithoutSubscriptions)
+{
+    const KestoReportingDriverUtility utility;
+    EXPECT_FALSE(utility.needsMoments());
+    EXPECT_THAT(platform.workQueues.made(), IsEmpty());
+}
+
+TEST_F(DriverUtility, ReadsMomentsOnAQueueOfItsOwn)
+{
+    publishAll();
+    const KestoReportingDriverUtility utility;
+    ASSERT_THAT(platform.workQueues.made(), SizeIs(1));
+    EXPECT_EQ(platform.workQueues.made()[0].name, "com.quarn.kesto.reporting.channels");
+    bool isRead = false;
+    utility.readMoment([&](auto) { isRead = true; });
+    EXPECT_FALSE(isRead);
+    EXPECT_EQ(channels.readings(), 1U) << "when it looked for channels";
+    platform.workQueues.runAll();
+    EXPECT_TRUE(isRead);
+    EXPECT_EQ(channels.readings(), 2U);
+}
+
+TEST_F(DriverUtility, ReadsOnceForAllThatAskedBeforeAndAgainForThoseThatAskMeanwhile)
+{
+    publishAll();
+    const KestoReportingDriverUtility utility;
+    std::vector<session::DriverMoment> moments;
+    const auto keep = [&](session::DriverMoment moment) { moments.push_back(std::move(moment)); };
+    utility.readMoment(keep);
+    utility.readMoment(keep);
+    utility.readMoment([&](auto) { utility.readMoment(keep); }); // runs when the channels have been read
+    platform.workQueues.runAll();
+    EXPECT_EQ(channels.readings(), 3U) << "the first when it looked for channels";
+    ASSERT_THAT(moments, SizeIs(3));
+    EXPECT_EQ(moments[0], moments[1]);
+    EXPECT_NE(moments[1], moments[2]);
+}
+
+TEST_F(DriverUtility, ReadsOnTheCallersThreadIfTheSystemHasNoOther)
+{
+    publishAll();
+    platform.workQueues.hasThreads = false;
+    const KestoReportingDriverUtility utility;
+    session::DriverMoment moment;
+    utility.readMoment([&](session::DriverMoment read) { moment = std::move(read); });
+    EXPECT_THAT(utility.getSnapShot(moment), SizeIs(8));
+}
+
 TEST_F(DriverUtility, SubscribesToEveryDriverThatPublishes)
 {
     publishAll();
@@ -104,7 +162,7 @@ TEST_F(DriverUtility, SaysOnceThatADriverHasNoChannelsAndNothingLater)
                     IsLine(Info, "kerd", "couldn't find any channels for driver group Tx-(null)"),
                     IsLine(Info, "kerd", "couldn't find any channels for driver group (null)-HwAudio2")));
     EXPECT_THAT(utility.ioChannelSubscriptions(), IsEmpty());
-    EXPECT_THAT(utility.getSnapShot(), IsEmpty());
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), IsEmpty());
     EXPECT_THAT(platform.log.take(), IsEmpty());
 }
 
@@ -163,7 +221,7 @@ TEST_F(DriverUtility, SubscribesToWhatCameBackBesideAnErrorAndDoesNotSayTheError
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Info, "kerd", "subscribed to group group Rx-(null)")));
     EXPECT_THAT(platform.log.lines(),
                 Not(Contains(IsLine(Error, "kerd", "error 9 creating subscription for Rx-(null)"))));
-    EXPECT_THAT(utility.getSnapShot(), SizeIs(1));
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), SizeIs(1));
 }
 
 TEST_F(DriverUtility, LeavesOutADriverWithChannelsButWithoutASubscription)
@@ -176,7 +234,7 @@ TEST_F(DriverUtility, LeavesOutADriverWithChannelsButWithoutASubscription)
     failures.subscribesAnyway = true;
     const KestoReportingDriverUtility utility;
     EXPECT_THAT(descriptions(utility), SizeIs(6));
-    EXPECT_THAT(utility.getSnapShot(), SizeIs(6));
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), SizeIs(6));
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerd", "error 9 creating subscription for Tx-(null)")));
     EXPECT_THAT(platform.log.lines(), Not(Contains(IsLine(Info, "kerd", "subscribed to group group Rx-(null)"))));
 }
@@ -189,7 +247,7 @@ TEST_F(DriverUtility, LeavesOutADriverThatCannotBeSubscribedTo)
     EXPECT_THAT(platform.log.lines(),
                 Contains(IsLine(Error, "kerd", "error 9 creating subscription for (null)-HwAudio2")));
     EXPECT_THAT(descriptions(utility), SizeIs(7));
-    EXPECT_THAT(utility.getSnapShot(), SizeIs(7));
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), SizeIs(7));
 }
 
 TEST_F(DriverUtility, SaysNothingOfADriverForWhichNeitherChannelsNorAnErrorComeBack)
@@ -218,7 +276,7 @@ TEST_F(DriverUtility, TakesASnapshotOfEveryDriverUnderItsDescription)
     publishAll();
     const KestoReportingDriverUtility utility;
     platform.log.clear();
-    const auto snapShot = utility.getSnapShot();
+    const auto snapShot = utility.getSnapShot(driverMoment(utility, platform));
     EXPECT_THAT(snapShot, SizeIs(8));
     ASSERT_THAT(snapShot, Contains(Key("(null)-MCA")));
     ASSERT_THAT(snapShot.at("(null)-MCA").channels, SizeIs(1));
@@ -236,7 +294,7 @@ TEST_F(DriverUtility, SaysWhichDriverItSamplesBeforeItDoes)
     std::vector<std::string> steps;
     platform.log.setObserver([&](const support::LogLine& line) { steps.push_back(line.message); });
     channels.setSampleObserver([&] { steps.emplace_back("sample"); });
-    EXPECT_THAT(utility.getSnapShot(), SizeIs(1));
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), SizeIs(1));
     platform.log.setObserver(nullptr);
     EXPECT_THAT(steps, ElementsAre("sampling driver Rx-(null)", "sample"));
 }
@@ -247,19 +305,19 @@ TEST_F(DriverUtility, KeepsTheOtherDriversWhenOneCannotBeSampled)
     const KestoReportingDriverUtility utility;
     channels.failures("Tx", std::nullopt).sample = 5;
     platform.log.clear();
-    const auto snapShot = utility.getSnapShot();
+    const auto snapShot = utility.getSnapShot(driverMoment(utility, platform));
     EXPECT_THAT(snapShot, SizeIs(7));
     EXPECT_THAT(snapShot, Not(Contains(Key("Tx-(null)"))));
     EXPECT_THAT(platform.log.lines(), Contains(IsLine(Error, "kerd", "creating samples of driver Tx-(null): error 5")));
     channels.failures("Tx", std::nullopt).sample.reset();
-    EXPECT_THAT(utility.getSnapShot(), SizeIs(8)) << "the subscription lives on";
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), SizeIs(8)) << "the subscription lives on";
 }
 
 TEST_F(DriverUtility, NeverSubscribesAgain)
 {
     const KestoReportingDriverUtility utility;
     publishAll();
-    EXPECT_THAT(utility.getSnapShot(), IsEmpty());
+    EXPECT_THAT(utility.getSnapShot(driverMoment(utility, platform)), IsEmpty());
     EXPECT_THAT(channels.asked(), SizeIs(8));
 }
 
@@ -267,10 +325,10 @@ TEST_F(DriverUtility, SnapshotsHoldWhatTheChannelsHeldThen)
 {
     channels.publish(channelOf("Speaker", std::nullopt, 5));
     const KestoReportingDriverUtility utility;
-    const auto snapShot = utility.getSnapShot();
+    const auto snapShot = utility.getSnapShot(driverMoment(utility, platform));
     channels.publish(channelOf("Speaker", std::nullopt, 8));
     EXPECT_EQ(snapShot.at("Speaker-(null)").channels.at(0).value, 5);
-    EXPECT_EQ(utility.getSnapShot().at("Speaker-(null)").channels.at(0).value, 8);
+    EXPECT_EQ(utility.getSnapShot(driverMoment(utility, platform)).at("Speaker-(null)").channels.at(0).value, 8);
 }
 
 } // namespace

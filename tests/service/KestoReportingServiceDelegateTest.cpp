@@ -279,13 +279,23 @@ TEST(ServiceDriverStatistics, AreTakenAndReportedByItsSampler)
     const auto session = player.session(42);
     const auto onQueue = [&](auto work) { return onServerQueue(harness.platform.workQueues, work); };
 
-    const auto snapShot = onQueue([&] { return harness.service->getSnapShot(); });
+    const auto readMoment = [&] {
+        session::DriverMoment moment;
+        harness.service->readDriverMoment([&](session::DriverMoment read) { moment = std::move(read); });
+        harness.platform.workQueues.runAll();
+        return moment;
+    };
+
+    ASSERT_TRUE(harness.service->needsDriverMoments());
+    const auto snapShot = onQueue([&, then = readMoment()] { return harness.service->getSnapShot(then); });
     ASSERT_THAT(snapShot, SizeIs(1));
     EXPECT_EQ(snapShot.begin()->first, "Speaker-(null)");
     onQueue([&] { session->setDriverSnapShot(snapShot); });
     underruns.value = 8;
     harness.platform.reportingChannels.publish(underruns);
-    onQueue([&](platform::Turn& turn) { harness.service->sendDriverLogsForSession(turn, session); });
+    onQueue([&, now = readMoment()](platform::Turn& turn) {
+        harness.service->sendDriverLogsForSession(turn, session, now);
+    });
     const auto messages = session->nestedAggregatedPayloadData().value();
     ASSERT_THAT(messages, SizeIs(1));
     const Dictionary told = *messages[0].values()[0].dictionary();

@@ -144,9 +144,14 @@ ReportingChannel states(std::vector<platform::StateResidency> given)
 
 class ReportingChannelsContract : public Suite<ReportingChannelsSubject> {
 protected:
+    std::shared_ptr<const ReportingChannels::Moment> moment() { return subject->channels().readChannels({{}}); }
+    ReportingChannels::FoundChannels find(Name group, Name subgroup)
+    {
+        return subject->channels().copyChannelsInGroup(group, subgroup, *moment());
+    }
     ReportingChannels::Subscribed subscribe(Name group, Name subgroup)
     {
-        const auto found = subject->channels().copyChannelsInGroup(group, subgroup);
+        const auto found = find(group, subgroup);
         EXPECT_EQ(found.error, std::nullopt);
         auto subscribed = subject->channels().createSubscription(*found.channels);
         EXPECT_EQ(subscribed.error, std::nullopt);
@@ -156,7 +161,7 @@ protected:
     }
     ReportingSample sample(const ReportingChannels::Subscribed& subscribed)
     {
-        return subject->channels().createSamples(*subscribed.subscription, *subscribed.channels).value();
+        return subject->channels().createSamples(*subscribed.subscription, *subscribed.channels, *moment()).value();
     }
     // The only channel of the difference between two states of it.
     ReportingChannel difference(const ReportingChannel& before, const ReportingChannel& now)
@@ -184,7 +189,7 @@ TEST_P(ReportingChannelsContract, AreFoundByGroupAndSubgroupAndAnAbsentOneMeansA
     subject->publish(in("Speaker", std::nullopt, simple("b", 2)));
     subject->publish(in(std::nullopt, "MCA", simple("c", 3)));
     const auto namesOf = [&](Name group, Name subgroup) {
-        const auto found = subject->channels().copyChannelsInGroup(group, subgroup);
+        const auto found = find(group, subgroup);
         const auto values = valuesOf(sample(subscribe(group, subgroup)));
         EXPECT_EQ(subject->channels().channelCount(*found.channels), values.size());
         std::string names;
@@ -201,7 +206,7 @@ TEST_P(ReportingChannelsContract, AreFoundByGroupAndSubgroupAndAnAbsentOneMeansA
 TEST_P(ReportingChannelsContract, AreASetWithoutChannelsOrNoneWithoutPublishers)
 {
     subject->publish(simple("a", 1));
-    const auto found = subject->channels().copyChannelsInGroup("Rx", std::nullopt);
+    const auto found = find("Rx", std::nullopt);
     EXPECT_EQ(found.error, std::nullopt);
     EXPECT_TRUE(found.channels == nullptr || subject->channels().channelCount(*found.channels) == 0);
 }
@@ -209,12 +214,12 @@ TEST_P(ReportingChannelsContract, AreASetWithoutChannelsOrNoneWithoutPublishers)
 TEST_P(ReportingChannelsContract, AreCountedAsTheyWereWhenTheSetWasFound)
 {
     subject->publish(simple("a", 1));
-    const auto found = subject->channels().copyChannelsInGroup("Speaker", std::nullopt);
+    const auto found = find("Speaker", std::nullopt);
     const auto subscribed = subject->channels().createSubscription(*found.channels);
     subject->publish(simple("b", 1));
     EXPECT_EQ(subject->channels().channelCount(*found.channels), 1U);
     EXPECT_EQ(subject->channels().channelCount(*subscribed.channels), 1U);
-    const auto again = subject->channels().copyChannelsInGroup("Speaker", std::nullopt);
+    const auto again = find("Speaker", std::nullopt);
     EXPECT_EQ(subject->channels().channelCount(*again.channels), 2U);
 }
 
@@ -230,6 +235,24 @@ TEST_P(ReportingChannelsContract, AreSampledAsTheyAreAtThatMoment)
     subject->withdraw(simple("gone", 1));
     EXPECT_THAT(valuesOf(sample(subscribed)), ElementsAre(Pair("changed", 5), Pair("new", 7)));
     EXPECT_THAT(valuesOf(before), ElementsAre(Pair("changed", 1), Pair("gone", 1))) << "a sample stays as it is";
+}
+
+TEST_P(ReportingChannelsContract, StayInAMomentAsTheyWereForTheSamplesOfAllGroups)
+{
+    subject->publish(simple("a", 1));
+    subject->publish(in("Rx", std::nullopt, simple("b", 2)));
+    subject->publish(in("Tx", std::nullopt, simple("c", 3)));
+    const auto speaker = subscribe("Speaker", std::nullopt);
+    const auto rx = subscribe("Rx", std::nullopt);
+    const auto then = subject->channels().readChannels({{"Speaker", {}}, {"Rx", {}}});
+    subject->publish(simple("a", 10));
+    subject->withdraw(in("Rx", std::nullopt, simple("b", 2)));
+    const auto sampleThen = [&](const ReportingChannels::Subscribed& of) {
+        return valuesOf(subject->channels().createSamples(*of.subscription, *of.channels, *then).value());
+    };
+    EXPECT_THAT(sampleThen(speaker), ElementsAre(Pair("a", 1)));
+    EXPECT_THAT(sampleThen(rx), ElementsAre(Pair("b", 2)));
+    EXPECT_THAT(valuesOf(sample(speaker)), ElementsAre(Pair("a", 10)));
 }
 
 TEST_P(ReportingChannelsContract, AreSampledWithAllThatTheyHave)
@@ -279,9 +302,9 @@ TEST_P(ReportingChannelsContract, AnswerWithAnErrorWhileTheyCannotBeRead)
     subject->publish(simple("a", 1));
     const auto subscribed = subscribe(std::nullopt, std::nullopt);
     subject->breakDown(true);
-    const auto found = subject->channels().copyChannelsInGroup(std::nullopt, std::nullopt);
+    const auto found = find(std::nullopt, std::nullopt);
     EXPECT_TRUE(found.error && *found.error != 0);
-    const auto failed = subject->channels().createSamples(*subscribed.subscription, *subscribed.channels);
+    const auto failed = subject->channels().createSamples(*subscribed.subscription, *subscribed.channels, *moment());
     ASSERT_FALSE(failed);
     EXPECT_NE(failed.error(), 0);
     subject->breakDown(false);

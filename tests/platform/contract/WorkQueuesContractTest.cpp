@@ -161,6 +161,57 @@ TEST_P(WorkQueuesContract, AnItemOfALaneMaySubmitToAnother)
     EXPECT_THAT(waitForNotes(1), ElementsAre("1"));
 }
 
+TEST_P(WorkQueuesContract, ALaneThatPausesHoldsBackItsItemsAndNoOthers)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    const auto elsewhere = makeQueue();
+    const auto lane = queue->makeLane(1000);
+    const auto other = queue->makeLane(1000);
+    platform::Lane::Resume resume;
+    lane->submitLong([&](platform::Turn&) {
+        resume = lane->pause();
+        note("pauses");
+    });
+    lane->submit(noting("held back"));
+    waitForNotes(1);
+    lane->submit(noting("held back, too"));
+    other->submit(noting("of another lane"));
+    queue->submit(noting("of the queue"));
+    EXPECT_THAT(waitForNotes(3), testing::UnorderedElementsAre("pauses", "of another lane", "of the queue"));
+    elsewhere->submit([&] { resume([&](platform::Turn&) { note(queue->isCurrent() ? "goes on" : "not current"); }); });
+    const auto all = waitForNotes(6);
+    EXPECT_THAT(std::vector(all.begin() + 3, all.end()), ElementsAre("goes on", "held back", "held back, too"));
+}
+
+TEST_P(WorkQueuesContract, ALaneMayGoOnBeforeTheItemThatPausedItIsOver)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    const auto lane = queue->makeLane(1000);
+    lane->submitLong([&](platform::Turn&) {
+        lane->pause()([&](platform::Turn&) { note("goes on"); });
+        note("pauses");
+    });
+    lane->submit(noting("behind"));
+    EXPECT_THAT(waitForNotes(3), ElementsAre("pauses", "goes on", "behind"));
+}
+
+TEST_P(WorkQueuesContract, ALaneMayPauseAgainAndAgain)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    const auto elsewhere = makeQueue();
+    const auto lane = queue->makeLane(1000);
+    for (int item = 0; item < 100; ++item)
+        lane->submitLong([&, item](platform::Turn&) {
+            elsewhere->submit([&, item, resume = lane->pause()]() mutable {
+                resume([&, item](platform::Turn&) { note(std::to_string(item)); });
+            });
+        });
+    const auto all = waitForNotes(100);
+    ASSERT_EQ(all.size(), 100U);
+    for (int item = 0; item < 100; ++item)
+        EXPECT_EQ(all[static_cast<std::size_t>(item)], std::to_string(item));
+}
+
 TEST_P(WorkQueuesContract, ALaneWithFewItemsIsNotFull)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});

@@ -68,7 +68,7 @@ protected:
     // Of the channels as the service sees them.
     [[nodiscard]] std::vector<std::string> channels() const
     {
-        const auto reading = platform::ChannelTree(root).read({}).value();
+        const auto reading = platform::ChannelTree(root).read({{}}).value();
         EXPECT_THAT(reading.problems, IsEmpty());
         std::vector<std::string> names;
         for (const auto& channel : reading.channels)

@@ -34,7 +34,7 @@ protected:
         EXPECT_EQ(publisher.open(options), Status::Ok);
     }
 
-    [[nodiscard]] platform::ChannelReading read() const { return platform::ChannelTree(root).read({}).value(); }
+    [[nodiscard]] platform::ChannelReading read() const { return platform::ChannelTree(root).read({{}}).value(); }
     // The value of the only channel.
     [[nodiscard]] std::int64_t value() const
     {

@@ -2,8 +2,10 @@
 #include "support/fakes/FakeReportingChannels.h"
 
 #include "platform/linux/channels/ChannelDifference.h"
+#include "platform/linux/channels/ChannelSelections.h"
 
 #include <algorithm>
+#include <iterator>
 #include <tuple>
 
 namespace support {
@@ -19,6 +21,20 @@ struct FakeReportingChannels::Selection final : ChannelSet {
     Name group;
     Name subgroup;
     std::size_t count = 0;
+};
+
+// A moment is a copy of the selected channels.
+struct FakeReportingChannels::Copy final : Moment {
+    std::vector<ReportingChannel> channels;
+
+    [[nodiscard]] std::vector<ReportingChannel> select(const Selection& selection) const
+    {
+        std::vector<ReportingChannel> selected;
+        std::ranges::copy_if(channels, std::back_inserter(selected), [&](const ReportingChannel& channel) {
+            return platform::selects({selection.group, selection.subgroup}, channel.group, channel.subgroup);
+        });
+        return selected;
+    }
 };
 
 namespace {
@@ -48,23 +64,24 @@ void FakeReportingChannels::withdraw(const ReportingChannel& channel)
     std::erase_if(channels_, [&](const auto& other) { return isSameChannel(other, channel); });
 }
 
-std::vector<ReportingChannel> FakeReportingChannels::select(const Selection& selection) const
+std::shared_ptr<const platform::ReportingChannels::Moment>
+FakeReportingChannels::readChannels(const std::vector<platform::ChannelSelection>& selections)
 {
-    std::vector<ReportingChannel> selected;
-    for (const auto& channel : channels_)
-        if ((!selection.group || channel.group == selection.group)
-            && (!selection.subgroup || channel.subgroup == selection.subgroup))
-            selected.push_back(channel);
-    return selected;
+    ++readings_;
+    const auto moment = std::make_shared<Copy>();
+    std::ranges::copy_if(channels_, std::back_inserter(moment->channels), [&](const ReportingChannel& channel) {
+        return platform::selects(selections, channel.group, channel.subgroup);
+    });
+    return moment;
 }
 
 platform::ReportingChannels::FoundChannels
 FakeReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group,
-                                           std::optional<std::string_view> subgroup)
+                                           std::optional<std::string_view> subgroup, const Moment& moment)
 {
     const auto selection = std::make_shared<Selection>(Name(group), Name(subgroup));
     const Failures& failing = failures(selection->group, selection->subgroup);
-    selection->count = select(*selection).size();
+    selection->count = dynamic_cast<const Copy&>(moment).select(*selection).size();
     asked_.emplace_back(selection->group, selection->subgroup);
     if (failing.copiesNothing || (failing.copy && !failing.copiesAnyway))
         return {.channels = nullptr, .error = failing.copy};
@@ -89,14 +106,14 @@ platform::ReportingChannels::Subscribed FakeReportingChannels::createSubscriptio
 }
 
 std::expected<ReportingSample, platform::ReportingChannelError>
-FakeReportingChannels::createSamples(const Subscription&, const ChannelSet& channels)
+FakeReportingChannels::createSamples(const Subscription&, const ChannelSet& channels, const Moment& moment)
 {
     if (sampleObserver_)
         sampleObserver_();
     const auto& selection = dynamic_cast<const Selection&>(channels);
     if (const auto error = failures(selection.group, selection.subgroup).sample)
         return std::unexpected(*error);
-    return ReportingSample{select(selection)};
+    return ReportingSample{dynamic_cast<const Copy&>(moment).select(selection)};
 }
 
 std::expected<ReportingSample, platform::ReportingChannelError>

@@ -39,26 +39,31 @@ public:
     void setSampleObserver(std::function<void()> observer) { sampleObserver_ = std::move(observer); }
     void failDifferences(std::optional<Error> error) { differenceError_ = error; }
 
+    // How often channels were read.
+    [[nodiscard]] std::size_t readings() const { return readings_; }
     // The queried groups and subgroups, in order.
     [[nodiscard]] const std::vector<std::pair<Name, Name>>& asked() const { return asked_; }
 
     // Returns no channel set with an error, and an empty set for a group without channels.
-    FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
-                                      std::optional<std::string_view> subgroup) override;
+    [[nodiscard]] std::shared_ptr<const Moment>
+    readChannels(const std::vector<platform::ChannelSelection>& selections) override;
+    FoundChannels copyChannelsInGroup(std::optional<std::string_view> group, std::optional<std::string_view> subgroup,
+                                      const Moment& moment) override;
     [[nodiscard]] std::size_t channelCount(const ChannelSet& channels) const override;
     Subscribed createSubscription(const ChannelSet& channels) override;
-    std::expected<platform::ReportingSample, Error> createSamples(const Subscription& subscription,
-                                                                  const ChannelSet& channels) override;
+    std::expected<platform::ReportingSample, Error>
+    createSamples(const Subscription& subscription, const ChannelSet& channels, const Moment& moment) override;
     std::expected<platform::ReportingSample, Error> createDifference(const platform::ReportingSample& from,
                                                                      const platform::ReportingSample& to) override;
 
 private:
     struct Selection;
-    [[nodiscard]] std::vector<platform::ReportingChannel> select(const Selection& selection) const;
+    struct Copy;
 
     std::vector<platform::ReportingChannel> channels_;
     std::map<std::pair<Name, Name>, Failures> failures_;
     std::optional<Error> differenceError_;
+    std::size_t readings_ = 0;
     std::function<void()> sampleObserver_;
     std::vector<std::pair<Name, Name>> asked_;
 };

@@ -8,18 +8,19 @@ namespace {
 TEST(FakeReportingChannelsTest, EachStepFailsWhereTheTestWantsIt)
 {
     support::FakeReportingChannels channels;
+    const auto moment = channels.readChannels({{}});
     auto& failures = channels.failures("Rx", std::nullopt);
     failures.copy = 1;
-    EXPECT_EQ(channels.copyChannelsInGroup("Rx", std::nullopt).channels, nullptr);
+    EXPECT_EQ(channels.copyChannelsInGroup("Rx", std::nullopt, *moment).channels, nullptr);
     failures.copy.reset();
     failures.copiesNothing = true;
-    const auto neither = channels.copyChannelsInGroup("Rx", std::nullopt);
+    const auto neither = channels.copyChannelsInGroup("Rx", std::nullopt, *moment);
     EXPECT_EQ(neither.error, std::nullopt);
     EXPECT_EQ(neither.channels, nullptr);
     failures.copiesNothing = false;
     failures.copy = 1;
     failures.copiesAnyway = true;
-    const auto found = channels.copyChannelsInGroup("Rx", std::nullopt);
+    const auto found = channels.copyChannelsInGroup("Rx", std::nullopt, *moment);
     EXPECT_EQ(found.error, 1);
     ASSERT_NE(found.channels, nullptr);
     failures.subscription = 2;
@@ -31,7 +32,7 @@ TEST(FakeReportingChannelsTest, EachStepFailsWhereTheTestWantsIt)
     EXPECT_EQ(channels.createSubscription(*found.channels).error, std::nullopt);
     EXPECT_EQ(channels.createSubscription(*found.channels).channels, nullptr);
     failures.sample = 3;
-    EXPECT_EQ(channels.createSamples(*subscribed.subscription, *found.channels).error(), 3);
+    EXPECT_EQ(channels.createSamples(*subscribed.subscription, *found.channels, *moment).error(), 3);
     channels.failDifferences(4);
     EXPECT_EQ(channels.createDifference({}, {}).error(), 4);
 }

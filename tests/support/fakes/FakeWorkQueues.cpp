@@ -16,7 +16,7 @@ namespace {
 constexpr std::ptrdiff_t mostBackgroundThreads = 4;
 }
 
-class FakeWorkQueues::Queue final : public platform::Lane, public std::enable_shared_from_this<Queue> {
+class FakeWorkQueues::Queue final : public platform::TurnQueue, public std::enable_shared_from_this<Queue> {
 public:
     Queue(FakeWorkQueues& queues, std::ptrdiff_t mostAtOnce) : queues_(queues), mostAtOnce_(mostAtOnce) { }
 
@@ -24,11 +24,11 @@ public:
     {
         submit([item = std::move(item)](platform::Turn&) mutable { item(); });
     }
-    void submit(platform::TurnItem item) override { queues_.items_.push_back({shared_from_this(), std::move(item)}); }
-    // The order of submission is fair, because all items take equally long here; and a lane is never full.
-    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t) override { return shared_from_this(); }
-    [[nodiscard]] bool isFull() override { return false; }
-    void setRoomHandler(std::function<void()>) override { }
+    void submit(platform::TurnItem item) override
+    {
+        queues_.items_.push_back({shared_from_this(), nullptr, std::move(item)});
+    }
+    [[nodiscard]] std::shared_ptr<platform::Lane> makeLane(std::uint32_t user) override;
 
     [[nodiscard]] bool isCurrent() const override
     {
@@ -41,6 +41,45 @@ private:
     FakeWorkQueues& queues_;
     const std::ptrdiff_t mostAtOnce_;
 };
+
+// The order of submission is fair, because all items take equally long here; and a lane is never full.
+class FakeWorkQueues::QueueLane final : public platform::Lane, public std::enable_shared_from_this<QueueLane> {
+public:
+    QueueLane(FakeWorkQueues& queues, std::shared_ptr<Queue> queue) : queues_(queues), queue_(std::move(queue)) { }
+
+    void submit(platform::WorkItem item) override
+    {
+        submit([item = std::move(item)](platform::Turn&) mutable { item(); });
+    }
+    void submit(platform::TurnItem item) override
+    {
+        queues_.items_.push_back({queue_, shared_from_this(), std::move(item)});
+    }
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user) override { return queue_->makeLane(user); }
+    [[nodiscard]] bool isCurrent() const override { return queue_->isCurrent(); }
+    [[nodiscard]] bool isFull() override { return false; }
+    void setRoomHandler(std::function<void()>) override { }
+    [[nodiscard]] Resume pause() override
+    {
+        isPausing_ = true;
+        return [self = shared_from_this()](platform::TurnItem item) {
+            self->isPausing_ = false;
+            self->queues_.items_.push_front({self->queue_, self, std::move(item)});
+        };
+    }
+
+    [[nodiscard]] bool isPausing() const { return isPausing_; }
+
+private:
+    FakeWorkQueues& queues_;
+    const std::shared_ptr<Queue> queue_;
+    bool isPausing_ = false;
+};
+
+std::shared_ptr<platform::Lane> FakeWorkQueues::Queue::makeLane(std::uint32_t)
+{
+    return std::make_shared<QueueLane>(queues_, shared_from_this());
+}
 
 // While it lives, an item of the queue runs, and perhaps others inside it.
 class FakeWorkQueues::Run {
@@ -91,7 +130,9 @@ void FakeWorkQueues::runAll()
 
 bool FakeWorkQueues::runOne()
 {
-    const auto next = std::ranges::find_if(items_, [](const Item& item) { return item.queue->mayRun(); });
+    const auto next = std::ranges::find_if(items_, [](const Item& item) {
+        return item.queue->mayRun() && (item.lane == nullptr || !item.lane->isPausing());
+    });
     if (next == items_.end())
         return false;
     Item item = std::move(*next);

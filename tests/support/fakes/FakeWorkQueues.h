@@ -62,9 +62,11 @@ public:
 
 private:
     class Queue;
+    class QueueLane;
     class Run;
     struct Item {
         std::shared_ptr<Queue> queue;
+        std::shared_ptr<QueueLane> lane; // null: submitted to the queue itself
         platform::TurnItem work;
     };
     struct DelayedItem {

@@ -219,21 +219,21 @@ private:
     // Prints each problem when it first occurs.
     ReportingSample read()
     {
-        auto reading = tree_.read(options_.selection);
-        ReportingSample sample{.channels = {}, .isWhole = reading && reading->leftOut.isNothing()};
+        auto reading = tree_.read({options_.selection});
+        ReportingSample sample{.channels = {}, .isWhole = reading && reading->isWhole};
         if (reading) {
+            sample.cutUsers = std::move(reading->cutUsers);
             reportProblems(std::move(reading->problems));
             reportOnce(reading->leftOut.inWords({}), limits_);
             sample.channels = std::move(reading->channels);
         }
         reportOnce(reading ? Lines() : Lines{options_.root.native() + ": " + reading.error().message()}, failure_);
-        std::ranges::move(soundCards_.read(options_.selection), std::back_inserter(sample.channels));
+        std::ranges::move(soundCards_.read({options_.selection}), std::back_inserter(sample.channels));
         return sample;
     }
 
     void reportProblems(std::vector<platform::ChannelProblem> problems)
     {
-        std::ranges::sort(problems);
         for (const auto& problem : problems)
             if (!std::ranges::binary_search(problems_, problem))
                 fmt::print(stderr, "kesto: channel {} is left out: {}\n", printable(problem.path), problem.reason);

@@ -1,53 +1,43 @@
-// Problems are sorted, so that a look-up is cheap among many.
+// A reading has its problems in order, so that a look-up is cheap among many.
 #include "platform/linux/channels/ChannelComplaints.h"
 
 #include "platform/linux/files/SystemError.h"
 
 #include <algorithm>
-#include <utility>
+#include <array>
 
 namespace platform {
 
-ChannelComplaints::Memory ChannelComplaints::addQuery()
+namespace {
+constexpr std::array leftOutBounds{&LeftOutChannels::beyondDrivers, &LeftOutChannels::beyondFolders,
+                                   &LeftOutChannels::beyondNames,   &LeftOutChannels::beyondChannels,
+                                   &LeftOutChannels::beyondBytes,   &LeftOutChannels::beyondTime};
+} // namespace
+
+void ChannelComplaints::report(const ChannelReading& reading)
 {
     const foundation::Lock lock(lock_);
-    return memories_.emplace_back(std::make_shared<Findings>());
+    logProblems(reading.problems);
+    logLeftOut(reading.leftOut);
+    problems_ = reading.problems;
+    leftOut_ = reading.leftOut;
+    error_.clear();
 }
 
-void ChannelComplaints::forgetDroppedQueries()
+void ChannelComplaints::reportUnreadable(std::error_code error)
 {
     const foundation::Lock lock(lock_);
-    std::erase_if(memories_, [](const Memory& memory) { return memory.use_count() == 1; });
-}
-
-void ChannelComplaints::report(Findings found, const Memory& memory)
-{
-    std::ranges::sort(found.problems);
-    const foundation::Lock lock(lock_);
-    logProblems(found.problems);
-    logLeftOut(found.leftOut);
-    *memory = std::move(found);
-}
-
-void ChannelComplaints::reportUnreadable(std::error_code error, const Memory& memory)
-{
-    const foundation::Lock lock(lock_);
-    if (!anyRemembers([error](const Findings& each) { return each.error == error; }))
+    if (error != error_)
         log_.error("only sound cards have channels: {} cannot be read: {}", root_.native(),
                    systemErrorText(error.value()));
-    memory->error = error;
-}
-
-template <typename Condition> bool ChannelComplaints::anyRemembers(Condition condition) const
-{
-    return std::ranges::any_of(memories_, [&](const Memory& memory) { return condition(*memory); });
+    error_ = error;
 }
 
 void ChannelComplaints::logProblems(const std::vector<ChannelProblem>& problems) const
 {
     std::size_t count = 0;
     for (const ChannelProblem& problem : problems) {
-        if (anyRemembers([&](const Findings& each) { return std::ranges::binary_search(each.problems, problem); }))
+        if (std::ranges::binary_search(problems_, problem))
             continue;
         if (++count <= mostNamed)
             log_.error("channel {} is left out: {}", problem.path, problem.reason);
@@ -59,9 +49,8 @@ void ChannelComplaints::logProblems(const std::vector<ChannelProblem>& problems)
 
 void ChannelComplaints::logLeftOut(LeftOutChannels leftOut) const
 {
-    for (std::size_t LeftOutChannels::* bound :
-         {&LeftOutChannels::beyondChannels, &LeftOutChannels::beyondBytes, &LeftOutChannels::beyondNames})
-        if (anyRemembers([&](const Findings& each) { return each.leftOut.*bound > 0; }))
+    for (std::size_t LeftOutChannels::* bound : leftOutBounds)
+        if (leftOut_.*bound > 0)
             leftOut.*bound = 0;
         else
             ledger_.count(ledger::Counter::ChannelsLeftOut, leftOut.*bound);

@@ -95,6 +95,12 @@ void subtract(const ReportingChannel& earlier, ReportingChannel& channel)
     }
 }
 
+// Whether the channel may have existed without being in the sample.
+bool mayHaveMissed(const ReportingSample& sample, const ReportingChannel& channel)
+{
+    return !sample.isWhole || std::ranges::binary_search(sample.cutUsers, channel.user);
+}
+
 void shareOut(std::vector<StateResidency>& states)
 {
     double total = 0;
@@ -113,7 +119,7 @@ ReportingSample channelDifference(const ReportingSample& from, const ReportingSa
     difference.channels.reserve(to.channels.size());
     for (const ReportingChannel& now : to.channels) {
         const ReportingChannel* before = earlier.find(now);
-        if (before == nullptr && !from.isWhole)
+        if (before == nullptr && mayHaveMissed(from, now))
             continue;
         ReportingChannel& channel = difference.channels.emplace_back(now);
         if (before != nullptr && wentOn(*before, channel))

@@ -5,8 +5,8 @@
 //
 // A publisher may start again in between, and then all its counters start at 0. A channel was reset if a counter went
 // down, a bucket has other bounds, or a state is missing; its difference is then its whole later content. The same
-// holds for a channel that is missing in the earlier sample; but if that sample is incomplete, the channel may have
-// existed, and it has no difference.
+// holds for a channel that is missing in the earlier sample; but if that sample is incomplete, for all users or for the
+// channel's, the channel may have existed, and it has no difference.
 #pragma once
 
 #include "platform/ReportingChannels.h"

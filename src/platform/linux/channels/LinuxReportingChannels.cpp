@@ -1,7 +1,8 @@
-// Reads two sources, one after the other, with the same selection.
+// Reads two sources, one after the other, with the same selections.
 #include "platform/linux/channels/LinuxReportingChannels.h"
 
 #include "platform/linux/channels/ChannelDifference.h"
+#include "platform/linux/channels/ChannelSelections.h"
 
 #include <algorithm>
 #include <iterator>
@@ -9,25 +10,77 @@
 
 namespace platform {
 
-// The selected channels, their number at that time, and the problems of the last reading.
+// The selected channels, and their number when they were found.
 struct LinuxReportingChannels::Selection final : ChannelSet {
     ChannelSelection selection;
     std::size_t count = 0;
-    ChannelComplaints::Memory memory;
 };
 
-ReportingChannels::FoundChannels LinuxReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group,
-                                                                             std::optional<std::string_view> subgroup)
+// What both sources held.
+struct LinuxReportingChannels::Reading final : Moment {
+    ReportingSample ofTree;
+    std::error_code error; // why the tree could not be read
+    std::vector<ReportingChannel> ofSoundCards;
+
+    static std::vector<ReportingChannel> select(const std::vector<ReportingChannel>& channels,
+                                                const ChannelSelection& selection)
+    {
+        std::vector<ReportingChannel> selected;
+        std::ranges::copy_if(channels, std::back_inserter(selected), [&](const ReportingChannel& channel) {
+            return selects(selection, channel.group, channel.subgroup);
+        });
+        return selected;
+    }
+    [[nodiscard]] ReportingSample sampleOf(const ChannelSelection& selection) const
+    {
+        ReportingSample sample{select(ofTree.channels, selection), ofTree.isWhole, ofTree.cutUsers};
+        std::ranges::move(select(ofSoundCards, selection), std::back_inserter(sample.channels));
+        return sample;
+    }
+};
+
+std::shared_ptr<const ReportingChannels::Moment>
+LinuxReportingChannels::readChannels(const std::vector<ChannelSelection>& selections)
 {
+    const auto moment = std::make_shared<Reading>();
+    moment->ofSoundCards = soundCards_.read(selections);
+    if (auto reading = tree_.read(selections, knownDrivers())) {
+        complaints_.report(*reading);
+        rememberDrivers(reading->channels);
+        moment->ofTree = {std::move(reading->channels), reading->isWhole, std::move(reading->cutUsers)};
+    } else {
+        moment->error = reading.error();
+        moment->ofTree.isWhole = false;
+    }
+    return moment;
+}
+
+std::vector<std::string> LinuxReportingChannels::knownDrivers() const
+{
+    const foundation::Lock lock(lock_);
+    return knownDrivers_;
+}
+
+void LinuxReportingChannels::rememberDrivers(const std::vector<ReportingChannel>& channels)
+{
+    std::vector<std::string> drivers;
+    for (const ReportingChannel& channel : channels) // in the order of their drivers
+        if (drivers.empty() || drivers.back() != *channel.driver)
+            drivers.push_back(*channel.driver);
+    const foundation::Lock lock(lock_);
+    knownDrivers_ = std::move(drivers);
+}
+
+ReportingChannels::FoundChannels LinuxReportingChannels::copyChannelsInGroup(std::optional<std::string_view> group,
+                                                                             std::optional<std::string_view> subgroup,
+                                                                             const Moment& moment)
+{
+    const auto& reading = dynamic_cast<const Reading&>(moment);
     const auto found = std::make_shared<Selection>();
     found->selection = {std::optional<std::string>(group), std::optional<std::string>(subgroup)};
-    found->count = soundCards_.read(found->selection).size();
-    found->memory = complaints_.addQuery();
-    auto reading = tree_.read(found->selection);
-    if (!reading)
-        return {.channels = found, .error = reading.error().value()};
-    found->count += reading->channels.size();
-    complaints_.report({.problems = std::move(reading->problems), .leftOut = reading->leftOut}, found->memory);
+    found->count = reading.sampleOf(found->selection).channels.size();
+    if (reading.error)
+        return {.channels = found, .error = reading.error.value()};
     return {.channels = found, .error = {}};
 }
 
@@ -43,23 +96,16 @@ ReportingChannels::Subscribed LinuxReportingChannels::createSubscription(const C
             .error = {}};
 }
 
-std::expected<ReportingSample, ReportingChannelError> LinuxReportingChannels::createSamples(const Subscription&,
-                                                                                            const ChannelSet& channels)
+std::expected<ReportingSample, ReportingChannelError>
+LinuxReportingChannels::createSamples(const Subscription&, const ChannelSet& channels, const Moment& moment)
 {
-    const auto& subscribed = dynamic_cast<const Selection&>(channels);
-    complaints_.forgetDroppedQueries(); // not earlier: at its start the service makes one query after the other
-    auto reading = tree_.read(subscribed.selection);
-    auto ofSoundCards = soundCards_.read(subscribed.selection);
-    if (!reading && ofSoundCards.empty())
-        return std::unexpected(reading.error().value());
-    ReportingSample sample{.channels = {}, .isWhole = reading && reading->leftOut.isNothing()};
-    if (reading) {
-        sample.channels = std::move(reading->channels);
-        complaints_.report({.problems = std::move(reading->problems), .leftOut = reading->leftOut}, subscribed.memory);
-    } else {
-        complaints_.reportUnreadable(reading.error(), subscribed.memory);
-    }
-    std::ranges::move(ofSoundCards, std::back_inserter(sample.channels));
+    const auto& reading = dynamic_cast<const Reading&>(moment);
+    ReportingSample sample = reading.sampleOf(dynamic_cast<const Selection&>(channels).selection);
+    if (!reading.error)
+        return sample;
+    if (sample.channels.empty())
+        return std::unexpected(reading.error.value());
+    complaints_.reportUnreadable(reading.error);
     return sample;
 }
 

@@ -8,6 +8,7 @@
 // moment, so channels may come and go.
 #pragma once
 
+#include "foundation/Mutex.h"
 #include "platform/linux/channels/ChannelComplaints.h"
 #include "platform/linux/channels/ChannelTree.h"
 #include "platform/linux/channels/SoundCards.h"
@@ -15,7 +16,7 @@
 
 namespace platform {
 
-// One thread at a time for each set of channels; otherwise any. Error codes are the system's (`errno`).
+// Any thread. Error codes are the system's (`errno`).
 class LinuxReportingChannels final : public ReportingChannels {
 public:
     LinuxReportingChannels(const std::filesystem::path& channelRoot, std::filesystem::path soundRoot,
@@ -26,24 +27,34 @@ public:
     {
     }
 
-    // If the tree cannot be read, it returns the channels of the sound cards beside the error.
-    FoundChannels copyChannelsInGroup(std::optional<std::string_view> group,
-                                      std::optional<std::string_view> subgroup) override;
+    // One walk through the tree, and one look at the sound cards.
+    [[nodiscard]] std::shared_ptr<const Moment> readChannels(const std::vector<ChannelSelection>& selections) override;
+    // If the tree could not be read, it returns the channels of the sound cards beside the error.
+    FoundChannels copyChannelsInGroup(std::optional<std::string_view> group, std::optional<std::string_view> subgroup,
+                                      const Moment& moment) override;
     [[nodiscard]] std::size_t channelCount(const ChannelSet& channels) const override;
     Subscribed createSubscription(const ChannelSet& channels) override;
-    // If the tree cannot be read, the sample holds the channels of the sound cards; without such channels it returns
+    // If the tree could not be read, the sample holds the channels of the sound cards; without such channels it returns
     // the error.
-    std::expected<ReportingSample, ReportingChannelError> createSamples(const Subscription& subscription,
-                                                                        const ChannelSet& channels) override;
+    std::expected<ReportingSample, ReportingChannelError>
+    createSamples(const Subscription& subscription, const ChannelSet& channels, const Moment& moment) override;
     std::expected<ReportingSample, ReportingChannelError> createDifference(const ReportingSample& from,
                                                                            const ReportingSample& to) override;
 
 private:
     struct Selection;
+    struct Reading;
+
+    [[nodiscard]] std::vector<std::string> knownDrivers() const;
+    void rememberDrivers(const std::vector<ReportingChannel>& channels);
 
     const ChannelTree tree_;
     const SoundCards soundCards_;
     ChannelComplaints complaints_;
+    mutable foundation::Mutex lock_;
+    // Those that had channels when the tree was read last, ascending. A user who fills the root with folders does not
+    // keep them out.
+    std::vector<std::string> knownDrivers_ KESTO_GUARDED_BY(lock_);
 };
 
 } // namespace platform

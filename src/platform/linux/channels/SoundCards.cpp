@@ -3,6 +3,7 @@
 #include "platform/linux/channels/SoundCards.h"
 
 #include "foundation/values/String.h"
+#include "platform/linux/channels/ChannelSelections.h"
 #include "platform/linux/files/SmallFile.h"
 
 #include <algorithm>
@@ -177,11 +178,8 @@ std::string cardName(const fs::path& folder)
 
 } // namespace
 
-std::vector<ReportingChannel> SoundCards::read(const ChannelSelection& selection) const
+std::vector<ReportingChannel> SoundCards::read(const std::vector<ChannelSelection>& selections) const
 {
-    const auto isMeant = [](const std::optional<std::string>& name, const std::optional<std::string>& asked) {
-        return !asked || name == asked;
-    };
     std::vector<ReportingChannel> channels;
     std::size_t streams = 0;
     for (const std::string& card : numberedNames(root_, "card", "")) {
@@ -190,7 +188,7 @@ std::vector<ReportingChannel> SoundCards::read(const ChannelSelection& selection
         for (const std::string& device : numberedNames(root_ / card, "pcm", "pc")) {
             place.group = device.back() == 'p' ? "Tx" : "Rx";
             place.subgroup = device;
-            if (!isMeant(place.group, selection.group) || !isMeant(place.subgroup, selection.subgroup))
+            if (!selects(selections, place.group, place.subgroup))
                 continue;
             for (const std::string& stream : numberedNames(root_ / card / device, "sub", ""))
                 if (++streams <= mostStreams)

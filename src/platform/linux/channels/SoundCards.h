@@ -16,7 +16,7 @@
 // Times are milliseconds, and are missing for programs that do not ask for time stamps.
 #pragma once
 
-#include "platform/linux/channels/ChannelTree.h"
+#include "platform/ReportingChannels.h"
 
 #include <cstddef>
 #include <filesystem>
@@ -36,9 +36,9 @@ public:
     // The folder is /proc/asound, or one of the same form.
     explicit SoundCards(std::filesystem::path root) : root_(std::move(root)) { }
 
-    // The selected channels; none without a sound card. Files that cannot be read or parsed are left out, because cards
-    // come and go.
-    [[nodiscard]] std::vector<ReportingChannel> read(const ChannelSelection& selection) const;
+    // The channels that any of the selections selects; none without a sound card. Files that cannot be read or parsed
+    // are left out, because cards come and go.
+    [[nodiscard]] std::vector<ReportingChannel> read(const std::vector<ChannelSelection>& selections) const;
 
 private:
     const std::filesystem::path root_;

@@ -10,6 +10,7 @@ namespace platform {
 
 struct FairOrder::Lane : FairShares::Share {
     std::deque<Item> items;
+    bool isPausing = false;
     std::size_t together = 1; // items that are taken at once
     bool wantsRoom = false;
     std::shared_ptr<const RoomHandler> roomHandler;
@@ -38,7 +39,31 @@ std::shared_ptr<FairOrder::Lane> FairOrder::makeLane(std::uint32_t user)
 void FairOrder::add(const std::shared_ptr<Lane>& lane, Item item)
 {
     lane->items.push_back(std::move(item));
+    if (lane->isPausing) {
+        ++heldBack_;
+        return;
+    }
     ++waiting_;
+    shares_.enter(lane);
+}
+
+void FairOrder::pause(Lane& lane)
+{
+    assert(!lane.isPausing);
+    lane.isPausing = true;
+    ++pausing_;
+    heldBack_ += lane.items.size();
+    waiting_ -= lane.items.size();
+}
+
+void FairOrder::resume(const std::shared_ptr<Lane>& lane, Item item)
+{
+    assert(lane->isPausing);
+    lane->isPausing = false;
+    --pausing_;
+    heldBack_ -= lane->items.size();
+    lane->items.push_front(std::move(item));
+    waiting_ += lane->items.size();
     shares_.enter(lane);
 }
 
@@ -78,7 +103,7 @@ void FairOrder::charge(Duration time)
     auto& lane = static_cast<Lane&>(shares_.first());
     lane.together =
         time < longTogether ? std::min(2 * lane.together, mostTogether) : std::max<std::size_t>(lane.together / 2, 1);
-    shares_.charge(time, !lane.items.empty());
+    shares_.charge(time, !lane.items.empty() && !lane.isPausing);
 }
 
 } // namespace platform

@@ -35,9 +35,17 @@ public:
     [[nodiscard]] static bool isFull(Lane& lane);
     static void setRoomHandler(Lane& lane, std::shared_ptr<const RoomHandler> handler);
 
+    // The lane's items no longer wait, until `resume` makes this item its first. The lane must be the one that is being
+    // served, and its item must have come alone.
+    void pause(Lane& lane);
+    void resume(const std::shared_ptr<Lane>& lane, Item item);
+    // The number of lanes that pause, and of the items in them.
+    [[nodiscard]] std::size_t pausing() const noexcept { return pausing_; }
+    [[nodiscard]] std::size_t heldBack() const noexcept { return heldBack_; }
+
     // Whether items of several lanes wait or are being served.
     [[nodiscard]] bool isContested() const { return shares_.isContested(); }
-    // The number of items that wait.
+    // The number of items that wait; those of lanes that pause do not.
     [[nodiscard]] std::size_t waiting() const noexcept { return waiting_; }
     // The item that runs next; not when none waits.
     [[nodiscard]] const Item& front() const;
@@ -51,6 +59,8 @@ public:
 private:
     FairShares shares_;
     std::size_t waiting_ = 0;
+    std::size_t pausing_ = 0;
+    std::size_t heldBack_ = 0;
 };
 
 } // namespace platform

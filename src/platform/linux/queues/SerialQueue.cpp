@@ -47,6 +47,24 @@ public:
         FairOrder::setRoomHandler(lane, std::make_shared<const FairOrder::RoomHandler>(std::move(handler)));
     }
 
+    void pause(FairOrder::Lane& lane)
+    {
+        assert(isCurrent());
+        const foundation::Lock lock(lock_);
+        order_.pause(lane);
+    }
+
+    void resume(const std::shared_ptr<FairOrder::Lane>& lane, TurnItem item)
+    {
+        constexpr bool mayTakeLong = true;
+        const foundation::Lock lock(lock_);
+        order_.resume(lane, {std::move(item), mayTakeLong});
+        if (isTurnTaken_)
+            return;
+        isLeftToHelper_ = false; // a helper would leave this item anyway
+        wakeThread();
+    }
+
     void add(const std::shared_ptr<FairOrder::Lane>& lane, TurnItem item, bool mayTakeLong = false)
     {
         assert(!mayBeHelped_ || !thisThread.isHelper || !foundation::Lock::isAnyHeld());
@@ -103,14 +121,14 @@ public:
     void finish()
     {
         const foundation::Lock lock(lock_);
-        while (isTurnTaken_ || order_.waiting() != 0)
+        while (isTurnTaken_ || order_.waiting() != 0 || order_.pausing() != 0)
             finished_.wait(lock_);
     }
 
     [[nodiscard]] std::size_t unfinishedItems()
     {
         const foundation::Lock lock(lock_);
-        return order_.waiting() + takenInTurn_;
+        return order_.waiting() + order_.pausing() + order_.heldBack() + takenInTurn_;
     }
 
     // The calling thread's part in serial queues.
@@ -142,7 +160,7 @@ private:
         while (order_.waiting() == 0 || isTurnTaken_ || isLeftToHelper_) {
             if (std::exchange(isTurnLeft_, false))
                 return Duty::Turn;
-            if (isEnding_ && !isTurnTaken_)
+            if (isEnding_ && !isTurnTaken_ && order_.pausing() == 0)
                 return Duty::End;
             if (heap.isAsked())
                 return Duty::Heap;
@@ -197,7 +215,8 @@ private:
             turnTime_ += itemsTime_;
             items_.clear();
         }
-        if (leftInTurn_ == 0 || turnTime_ > (order_.isContested() ? longestTurn_ / partIfContested : longestTurn_))
+        if (leftInTurn_ == 0 || order_.waiting() == 0
+            || turnTime_ > (order_.isContested() ? longestTurn_ / partIfContested : longestTurn_))
             return Next::End;
         if (runner == Runner::Helper && order_.front().mayTakeLong)
             return Next::Leave;
@@ -281,6 +300,11 @@ public:
     }
     [[nodiscard]] bool isFull() override { return work_->isFull(*lane_); }
     void setRoomHandler(std::function<void()> handler) override { work_->setRoomHandler(*lane_, std::move(handler)); }
+    [[nodiscard]] Resume pause() override
+    {
+        work_->pause(*lane_);
+        return [work = work_, lane = lane_](TurnItem item) { work->resume(lane, std::move(item)); };
+    }
 
 private:
     const std::shared_ptr<Work> work_;

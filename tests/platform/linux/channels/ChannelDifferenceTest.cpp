@@ -79,6 +79,21 @@ TEST(ChannelDifference, IsNoneOfAChannelThatTheFirstSampleMayNotHaveSeen)
     EXPECT_EQ(channelDifference({{simple(5, "b")}}, inPart).channels.size(), 1U);
 }
 
+TEST(ChannelDifference, IsNoneOfAChannelWhoseUserTheFirstSampleDidNotSeeWhole)
+{
+    const auto of = [](std::uint32_t user, ReportingChannel channel) {
+        channel.user = user;
+        return channel;
+    };
+    const ReportingSample cut{.channels = {of(1001, simple(5, "a"))}, .cutUsers = {1001, 1003}};
+    const auto now = channelDifference(
+        cut,
+        {{of(1001, simple(6, "a")), of(1001, simple(7, "b")), of(1002, simple(8, "c")), of(1003, simple(9, "d"))}});
+    ASSERT_EQ(now.channels.size(), 2U);
+    EXPECT_EQ(now.channels[0].value, 1);
+    EXPECT_EQ(now.channels[1].value, 8) << "of another user, so it is new";
+}
+
 TEST(ChannelDifference, OfMoreThanANumberHoldsIsTheMostItHolds)
 {
     EXPECT_EQ(difference(simple(INT64_MIN), simple(INT64_MAX)).value, INT64_MAX);

@@ -78,7 +78,7 @@ protected:
     // The names of the existing channels.
     [[nodiscard]] std::vector<std::string> channels() const
     {
-        const auto reading = ChannelTree(root).read({}).value();
+        const auto reading = ChannelTree(root).read({{}}).value();
         EXPECT_THAT(reading.problems, IsEmpty()) << "leftover files are not a problem";
         std::vector<std::string> names;
         for (const ReportingChannel& channel : reading.channels)
@@ -212,7 +212,7 @@ TEST_F(ChannelOwnerTest, NoOwnerFileIsMadeWhereThereCanBeNone)
 TEST_F(ChannelOwnerTest, ALineThatNamesNoOwnerIsNotUnderstood)
 {
     support::writeFile(root / "amp/Tx/-/owned", "owner somebody\nsimple\n1\n");
-    const auto reading = ChannelTree(root).read({}).value();
+    const auto reading = ChannelTree(root).read({{}}).value();
     EXPECT_THAT(reading.channels, IsEmpty());
     EXPECT_THAT(reading.problems,
                 ElementsAre(ChannelProblem{"amp/Tx/-/owned", "it is neither simple nor histogram nor state"}));

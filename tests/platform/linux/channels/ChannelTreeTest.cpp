@@ -3,6 +3,8 @@
 #include "platform/linux/channels/ChannelFile.h"
 #include "support/TemporaryDirectory.h"
 
+#include <algorithm>
+#include <chrono>
 #include <fcntl.h>
 #include <gmock/gmock.h>
 #include <sys/socket.h>
@@ -37,7 +39,7 @@ protected:
     }
     [[nodiscard]] ChannelReading read(const ChannelSelection& selection = {}) const
     {
-        return ChannelTree(root).read(selection).value();
+        return ChannelTree(root).read({selection}).value();
     }
     // The problem of a wrong file beside a correct one.
     std::string_view onlyProblem()
@@ -109,7 +111,7 @@ TEST_F(ChannelTreeTest, IsReadInTheOrderOfNames)
 TEST_F(ChannelTreeTest, HoldsNothingWithoutARoot)
 {
     EXPECT_THAT(read().channels, IsEmpty());
-    EXPECT_THAT(ChannelTree("").read({})->channels, IsEmpty());
+    EXPECT_THAT(ChannelTree("").read({{}})->channels, IsEmpty());
     fs::create_directories(root);
     EXPECT_THAT(read().channels, IsEmpty());
     EXPECT_THAT(read().problems, IsEmpty());
@@ -118,14 +120,14 @@ TEST_F(ChannelTreeTest, HoldsNothingWithoutARoot)
 TEST_F(ChannelTreeTest, SaysWhyItsRootCannotBeRead)
 {
     support::writeFile(root, "a file");
-    EXPECT_EQ(ChannelTree(root).read({}).error(), std::errc::not_a_directory);
+    EXPECT_EQ(ChannelTree(root).read({{}}).error(), std::errc::not_a_directory);
 }
 
 TEST_F(ChannelTreeTest, MayHaveItsRootBehindALink)
 {
     publish("amp/Tx/-/a", "simple\n1\n");
     fs::create_directory_symlink(root, directory.path() / "link");
-    EXPECT_THAT(ChannelTree(directory.path() / "link").read({})->channels, SizeIs(1));
+    EXPECT_THAT(ChannelTree(directory.path() / "link").read({{}})->channels, SizeIs(1));
 }
 
 // --- channels that come, go and change
@@ -269,11 +271,11 @@ TEST_F(ChannelTreeTest, TakesSoManyChannelsAndCountsTheRest)
 {
     for (const char* name : {"a", "b", "c", "d", "e"})
         publish(fs::path("amp/Tx/-") / name, "simple\n1\n");
-    const ChannelReading reading = ChannelTree(root, {.channels = 3}).read({}).value();
+    const ChannelReading reading = ChannelTree(root, {.channels = 3}).read({{}}).value();
     EXPECT_THAT(reading.channels, ElementsAre(isChannel("a", 1), isChannel("b", 1), isChannel("c", 1)));
     EXPECT_EQ(reading.leftOut.beyondChannels, 2U);
     EXPECT_EQ(reading.leftOut.beyondBytes + reading.leftOut.beyondNames, 0U);
-    EXPECT_TRUE(ChannelTree(root, {.channels = 5}).read({})->leftOut.isNothing());
+    EXPECT_TRUE(ChannelTree(root, {.channels = 5}).read({{}})->leftOut.isNothing());
 }
 
 TEST_F(ChannelTreeTest, TakesSoManyBytesAndCountsTheRest)
@@ -294,18 +296,32 @@ TEST_F(ChannelTreeTest, TakesTheFileInWhichTheBytesEnd)
     const std::string text = "simple\n1\n";
     publish("amp/Tx/-/a", text);
     publish("amp/Tx/-/b", text);
-    EXPECT_TRUE(ChannelTree(root, {.bytes = text.size() + 1}).read({})->leftOut.isNothing());
-    EXPECT_EQ(ChannelTree(root, {.bytes = text.size()}).read({})->leftOut.beyondBytes, 1U);
+    EXPECT_TRUE(ChannelTree(root, {.bytes = text.size() + 1}).read({{}})->leftOut.isNothing());
+    EXPECT_EQ(ChannelTree(root, {.bytes = text.size()}).read({{}})->leftOut.beyondBytes, 1U);
 }
 
 TEST_F(ChannelTreeTest, SaysWhatIsLeftOutFromTheFirstOn)
 {
-    EXPECT_THAT((LeftOutChannels{.beyondChannels = 1, .beyondBytes = 1, .beyondNames = 1}.inWords(
-                    {.channels = 10, .bytes = 20, .names = 30})),
-                ElementsAre("channels left out of a sample: 1, beyond the 10 that it takes",
-                            "channels left out of a sample: 1, beyond the 20 bytes of files that it takes",
+    const LeftOutChannels each{.beyondDrivers = 1,
+                               .beyondFolders = 1,
+                               .beyondNames = 1,
+                               .beyondChannels = 1,
+                               .beyondBytes = 1,
+                               .beyondTime = 1};
+    EXPECT_THAT(each.inWords({.drivers = 10,
+                              .folders = 20,
+                              .names = 30,
+                              .channels = 40,
+                              .bytes = 50,
+                              .time = std::chrono::milliseconds(60)}),
+                ElementsAre("drivers left out of a sample: at least 1, beyond the 10 names in the channel root that it "
+                            "looks at",
+                            "folders left out of a sample: 1, beyond the 20 that it opens",
                             "folders left out of a sample, in part or whole: at least 1, beyond the 30 names that it "
-                            "looks at"));
+                            "looks at",
+                            "channels left out of a sample: 1, beyond the 40 that it takes",
+                            "channels left out of a sample: 1, beyond the 50 bytes of files that it takes",
+                            "folders and channels left out of a sample: at least 1, beyond the 60 ms that it takes"));
     EXPECT_THAT(LeftOutChannels().inWords({}), IsEmpty());
 }
 
@@ -317,13 +333,179 @@ TEST_F(ChannelTreeTest, LooksAtSoManyNamesInAllFoldersAndNoMore)
     publish("amp/Tx/-/b", "simple\n1\n");
     publish("amp/Tx/-/c", "simple\n1\n");
     const auto countWith = [&](std::size_t names) {
-        return ChannelTree(root, {.names = names}).read({})->leftOut.beyondNames;
+        return ChannelTree(root, {.names = names}).read({{}})->leftOut.beyondNames;
     };
-    constexpr std::size_t all = 4 * 2 + 3 + 6; // "." and "..", the folders, the files
+    constexpr std::size_t all = 3 * 2 + 2 + 6; // "." and "..", the folders, the files
     EXPECT_EQ(countWith(all), 0U);
     EXPECT_EQ(countWith(all - 1), 1U) << "the line says \"at least\"";
     EXPECT_EQ(countWith(1), 1U);
-    EXPECT_THAT(ChannelTree(root, {.names = 4}).read({})->channels, IsEmpty());
+    EXPECT_THAT(ChannelTree(root, {.names = 4}).read({{}})->channels, IsEmpty());
+}
+
+// --- shares of users
+
+class ChannelTreeOfSeveralUsersTest : public ChannelTreeTest {
+protected:
+    void SetUp() override
+    {
+        if (::geteuid() != 0)
+            GTEST_SKIP() << "needs root, to make folders of several users";
+    }
+    static constexpr uid_t modest = 1000;
+    static constexpr uid_t greedy = 1001;
+
+    // Makes a driver's folder with what was published there the user's.
+    void giveTo(uid_t user, const fs::path& driver) const
+    {
+        ASSERT_EQ(::lchown((root / driver).c_str(), user, user), 0);
+    }
+    void publishAs(uid_t user, const std::string& driver, int count)
+    {
+        for (int index = 0; index < count; ++index)
+            publish(fs::path(driver) / "Tx/-" / std::to_string(index), "simple\n1\n");
+        giveTo(user, driver);
+    }
+    void makeEmptyDrivers(uid_t user, int count) const
+    {
+        for (int index = 0; index < count; ++index) {
+            const std::string driver = "empty " + std::to_string(index);
+            fs::create_directories(root / driver);
+            giveTo(user, driver);
+        }
+    }
+    static std::size_t countOf(uid_t user, const ChannelReading& reading)
+    {
+        return static_cast<std::size_t>(std::ranges::count(reading.channels, user, &ReportingChannel::user));
+    }
+    [[nodiscard]] ChannelReading readWith(const ChannelTree::Limits& limits) const
+    {
+        return ChannelTree(root, limits).read({{}}).value();
+    }
+};
+
+TEST_F(ChannelTreeOfSeveralUsersTest, ManyFoldersOfOneKeepOutNoChannelOfAnother)
+{
+    makeEmptyDrivers(greedy, 100);
+    publishAs(modest, "zither", 20);
+    const ChannelReading reading = readWith({.folders = 20, .names = 200});
+    EXPECT_EQ(countOf(modest, reading), 20U);
+    EXPECT_EQ(reading.leftOut.beyondFolders, 100U - (20 - 3));
+    EXPECT_THAT(reading.cutUsers, ElementsAre(greedy));
+    EXPECT_TRUE(reading.isWhole) << "all drivers were seen";
+}
+
+TEST_F(ChannelTreeOfSeveralUsersTest, ManyChannelsOfOneKeepOutNoChannelOfAnother)
+{
+    publishAs(greedy, "amp", 500);
+    publishAs(modest, "zither", 90);
+    const ChannelReading reading = readWith({.channels = 200});
+    EXPECT_EQ(countOf(modest, reading), 90U);
+    EXPECT_EQ(countOf(greedy, reading), 110U) << "the user with many gets the rest";
+    EXPECT_EQ(reading.leftOut.beyondChannels, 390U);
+    EXPECT_THAT(reading.cutUsers, ElementsAre(greedy));
+}
+
+TEST_F(ChannelTreeOfSeveralUsersTest, BothWithManyHaveHalfEach)
+{
+    publishAs(greedy, "amp", 500);
+    publishAs(modest, "zither", 500);
+    const ChannelReading reading = readWith({.channels = 256});
+    EXPECT_EQ(countOf(modest, reading), 128U);
+    EXPECT_EQ(countOf(greedy, reading), 128U);
+    EXPECT_THAT(reading.cutUsers, ElementsAre(modest, greedy));
+}
+
+TEST_F(ChannelTreeOfSeveralUsersTest, ManyNamesOfOneKeepOutNoChannelOfAnother)
+{
+    for (int group = 0; group < 9; ++group)
+        for (int index = 0; index < 30; ++index)
+            publish("amp/" + std::to_string(group) + "/." + std::to_string(index), "");
+    giveTo(greedy, "amp");
+    publishAs(modest, "zither", 20);
+    const ChannelReading reading = readWith({.names = 100, .namesOfAFolder = 25});
+    EXPECT_EQ(countOf(modest, reading), 20U);
+    EXPECT_EQ(reading.leftOut.beyondNames, 9U);
+    EXPECT_THAT(reading.cutUsers, ElementsAre(greedy));
+}
+
+TEST_F(ChannelTreeOfSeveralUsersTest, ManyBytesOfOneKeepOutNoChannelOfAnother)
+{
+    for (int index = 0; index < 20; ++index)
+        publish("amp/Tx/-/" + std::to_string(index), "histogram " + std::string(30'000, 'm') + "\n0 0\n");
+    giveTo(greedy, "amp");
+    publishAs(modest, "zither", 190);
+    const ChannelReading reading = readWith({.bytes = 200'000});
+    EXPECT_EQ(countOf(modest, reading), 190U);
+    EXPECT_EQ(countOf(greedy, reading), 7U);
+    EXPECT_EQ(reading.leftOut.beyondBytes, 13U);
+}
+
+// --- time
+
+class SteppingClock {
+public:
+    // Goes on by a millisecond with each look.
+    std::chrono::steady_clock::time_point operator()() { return now_ += std::chrono::milliseconds(1); }
+
+private:
+    std::chrono::steady_clock::time_point now_;
+};
+
+TEST_F(ChannelTreeTest, TakesSoMuchTimeAndCountsTheRest)
+{
+    for (int index = 0; index < 200; ++index)
+        publish("amp/Tx/-/" + std::to_string(index), "simple\n1\n");
+    constexpr int folders = 3;
+    constexpr std::size_t filesOfAStep = 32;
+    const ChannelTree tree(root, {.time = std::chrono::milliseconds(1 + folders + 2)}, SteppingClock());
+    const ChannelReading reading = tree.read({{}}).value();
+    EXPECT_THAT(reading.channels, SizeIs(2 * filesOfAStep));
+    EXPECT_EQ(reading.leftOut.beyondTime, 200 - 2 * filesOfAStep);
+    EXPECT_THAT(reading.cutUsers, ElementsAre(::geteuid()));
+}
+
+TEST_F(ChannelTreeTest, LooksForDriversHalfOfTheTime)
+{
+    for (int index = 0; index < 600; ++index)
+        fs::create_directories(root / std::to_string(index));
+    const ChannelTree tree(root, {.time = std::chrono::milliseconds(5)}, SteppingClock());
+    const ChannelReading reading = tree.read({{}}).value();
+    EXPECT_FALSE(reading.isWhole) << "it looks at the time after 256 names each";
+    EXPECT_GT(reading.leftOut.beyondTime, 500U);
+}
+
+TEST_F(ChannelTreeTest, LooksAtSoManyDriversAndNoMore)
+{
+    for (int index = 0; index < 10; ++index)
+        publish("driver " + std::to_string(index) + "/Tx/-/a", "simple\n1\n");
+    const auto readWith = [&](std::size_t drivers) {
+        return ChannelTree(root, {.drivers = drivers}).read({{}}).value();
+    };
+    constexpr std::size_t all = 2 + 10; // "." and ".." too
+    EXPECT_TRUE(readWith(all).isWhole);
+    EXPECT_THAT(readWith(all).channels, SizeIs(10));
+    EXPECT_FALSE(readWith(all - 1).isWhole);
+    EXPECT_EQ(readWith(all - 1).leftOut.beyondDrivers, 1U);
+}
+
+TEST_F(ChannelTreeTest, OpensSoManyFoldersAndCountsTheRest)
+{
+    for (int index = 0; index < 10; ++index)
+        fs::create_directories(root / std::to_string(index));
+    EXPECT_EQ(ChannelTree(root, {.folders = 8}).read({{}})->leftOut.beyondFolders, 2U);
+    EXPECT_EQ(ChannelTree(root, {.folders = 2}).read({{}})->leftOut.beyondFolders, 8U);
+    EXPECT_TRUE(ChannelTree(root, {.folders = 10}).read({{}})->leftOut.isNothing());
+}
+
+TEST_F(ChannelTreeTest, ReadsTheChannelsOfSeveralGroupsTogether)
+{
+    publish("amp/Speaker/-/a", "simple\n1\n");
+    publish("amp/-/MCA/b", "simple\n2\n");
+    publish("amp/Speaker/MCA/c", "simple\n3\n");
+    publish("amp/Rx/-/d", "simple\n4\n");
+    EXPECT_THAT(ChannelTree(root).read({{"Speaker", {}}, {{}, "MCA"}})->channels,
+                ElementsAre(isChannel("b", 2), isChannel("a", 1), isChannel("c", 3)));
+    EXPECT_THAT(ChannelTree(root).read({})->channels, IsEmpty());
 }
 
 } // namespace

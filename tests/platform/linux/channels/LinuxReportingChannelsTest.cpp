@@ -28,14 +28,20 @@ protected:
         fs::create_directories((root / place).parent_path());
         support::writeFile(root / place, text);
     }
+    static ReportingChannels::FoundChannels find(LinuxReportingChannels& in, Name group, Name subgroup)
+    {
+        return in.copyChannelsInGroup(group, subgroup, *in.readChannels(all));
+    }
     ReportingChannels::Subscribed subscribe(Name group, Name subgroup)
     {
-        return channels.createSubscription(*channels.copyChannelsInGroup(group, subgroup).channels);
+        return channels.createSubscription(*find(channels, group, subgroup).channels);
     }
     ReportingSample sample(const ReportingChannels::Subscribed& subscribed)
     {
-        return channels.createSamples(*subscribed.subscription, *subscribed.channels).value();
+        return channels.createSamples(*subscribed.subscription, *subscribed.channels, *channels.readChannels(all))
+            .value();
     }
+    static inline const std::vector<ChannelSelection> all{{}};
     static std::map<std::string, std::int64_t> valuesOf(const ReportingSample& sample)
     {
         std::map<std::string, std::int64_t> values;
@@ -54,7 +60,7 @@ protected:
 
 TEST_F(LinuxReportingChannelsTest, AreMissingOnADeviceWithoutPublishers)
 {
-    const auto found = channels.copyChannelsInGroup("Speaker", std::nullopt);
+    const auto found = find(channels, "Speaker", std::nullopt);
     EXPECT_EQ(found.error, std::nullopt);
     ASSERT_NE(found.channels, nullptr);
     EXPECT_EQ(channels.channelCount(*found.channels), 0U);
@@ -129,48 +135,51 @@ TEST_F(LinuxReportingChannelsTest, NameTheBoundThatASampleMet)
     const auto subscribed = subscribe("Speaker", std::nullopt);
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(Error, "kerl",
-                                   "channels left out of a sample: 2, beyond the 2097152 bytes of files "
+                                   "channels left out of a sample: 2, beyond the 4194304 bytes of files "
                                    "that it takes")));
     EXPECT_THAT(sample(subscribed).channels, SizeIs(fitting));
     EXPECT_THAT(log.take(), IsEmpty()) << "once";
     EXPECT_EQ(ledger.account()[ledger::Counter::ChannelsLeftOut], 2U);
 
     LinuxReportingChannels few(root, sound, ledger, ProviderLog(log), {.channels = 10});
-    EXPECT_EQ(few.channelCount(*few.copyChannelsInGroup("Speaker", std::nullopt).channels), 10U);
+    EXPECT_EQ(few.channelCount(*find(few, "Speaker", std::nullopt).channels), 10U);
     EXPECT_THAT(log.take(),
-                ElementsAre(IsLine(Error, "kerl", "channels left out of a sample: 62, beyond the 10 that it takes")));
+                ElementsAre(IsLine(Error, "kerl", "channels left out of a sample: 132, beyond the 10 that it takes")));
 
     LinuxReportingChannels blind(root, sound, ledger, ProviderLog(log), {.names = 4});
-    EXPECT_EQ(blind.channelCount(*blind.copyChannelsInGroup("Speaker", std::nullopt).channels), 0U);
+    EXPECT_EQ(blind.channelCount(*find(blind, "Speaker", std::nullopt).channels), 0U);
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(Error, "kerl",
                                    "folders left out of a sample, in part or whole: at least 1, beyond the "
                                    "4 names that it looks at")));
 }
 
-// A problem that every query of the starting service finds.
 TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
 {
     fs::create_directories(root);
     fs::create_directory_symlink(directory.path(), root / "link");
     for (const char* name : {"a", "b", "c", "d", "e"})
         publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
-    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.names = 15});
+    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.names = 11});
+    const std::vector<ChannelSelection> groups{{"QuarnZT4", {}},     {"Speaker", {}}, {{}, "MCA"},
+                                               {"Haptics", "Stats"}, {"Rx", {}},      {{}, "HwAudio2"}};
+    const auto atStart = bounded.readChannels(groups);
     std::vector<ReportingChannels::Subscribed> subscribed;
-    for (const auto& [group, subgroup] : std::vector<std::pair<Name, Name>>{
-             {"QuarnZT4", {}}, {"Speaker", {}}, {{}, "MCA"}, {"Haptics", "Stats"}, {"Rx", {}}, {{}, "HwAudio2"}})
-        if (const auto found = bounded.copyChannelsInGroup(group, subgroup); bounded.channelCount(*found.channels) > 0)
+    for (const auto& [group, subgroup] : groups)
+        if (const auto found = bounded.copyChannelsInGroup(group, subgroup, *atStart);
+            bounded.channelCount(*found.channels) > 0)
             subscribed.push_back(bounded.createSubscription(*found.channels));
     const auto wrong = {
         IsLine(Error, "kerl", "channel link is left out: Not a directory"),
         IsLine(Error, "kerl",
-               "folders left out of a sample, in part or whole: at least 1, beyond the 15 names that it looks at")};
+               "folders left out of a sample, in part or whole: at least 1, beyond the 11 names that it looks at")};
     EXPECT_THAT(log.take(), ElementsAreArray(wrong));
     EXPECT_EQ(ledger.account()[ledger::Counter::ChannelsLeftOut], 2U) << "the link, and at least one folder";
     ASSERT_THAT(subscribed, SizeIs(2));
     const auto sampleAll = [&] {
+        const auto moment = bounded.readChannels(groups);
         for (const auto& each : subscribed)
-            EXPECT_TRUE(bounded.createSamples(*each.subscription, *each.channels));
+            EXPECT_TRUE(bounded.createSamples(*each.subscription, *each.channels, *moment));
     };
     sampleAll();
     EXPECT_THAT(log.take(), IsEmpty());
@@ -190,7 +199,7 @@ TEST_F(LinuxReportingChannelsTest, OfSoundCardsAreThereThoughTheTreeCannotBeRead
     support::writeFile(root, "a file in its place");
     fs::copy(fs::path(KESTO_RECORDED_SOUND) / "none-running", sound,
              fs::copy_options::recursive | fs::copy_options::copy_symlinks);
-    const auto found = channels.copyChannelsInGroup("Tx", std::nullopt);
+    const auto found = find(channels, "Tx", std::nullopt);
     EXPECT_EQ(found.error, ENOTDIR);
     ASSERT_NE(found.channels, nullptr);
     EXPECT_EQ(channels.channelCount(*found.channels), 16U);
@@ -229,7 +238,32 @@ TEST_F(LinuxReportingChannelsTest, AreAnErrorWhereTheTreeCannotBeReadAndNoSoundC
     const auto subscribed = subscribe("Speaker", std::nullopt);
     fs::remove_all(root);
     support::writeFile(root, "a file in its place");
-    EXPECT_EQ(channels.createSamples(*subscribed.subscription, *subscribed.channels).error(), ENOTDIR);
+    EXPECT_EQ(
+        channels.createSamples(*subscribed.subscription, *subscribed.channels, *channels.readChannels(all)).error(),
+        ENOTDIR);
+}
+
+TEST_F(LinuxReportingChannelsTest, OfKnownDriversAreReadHoweverManyFoldersCameMeanwhile)
+{
+    const auto publishOf = [&](const std::string& driver) { publish(driver + "/Tx/-/" + driver, "simple\n1\n"); };
+    const std::vector<std::string> known{"a", "b", "c", "d", "e"};
+    std::ranges::for_each(known, publishOf);
+    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.drivers = known.size() + 2});
+    const auto subscribed = bounded.createSubscription(*find(bounded, "Tx", std::nullopt).channels);
+    for (int other = 0; other < 50; ++other)
+        publishOf("other " + std::to_string(other));
+    const auto values = valuesOf(
+        bounded.createSamples(*subscribed.subscription, *subscribed.channels, *bounded.readChannels(all)).value());
+    for (const std::string& driver : known)
+        EXPECT_THAT(values, testing::Contains(Pair(driver, 1)));
+    EXPECT_LT(values.size(), 50U) << "the bound was met";
+    publish("a/Tx/-/a", "simple\n2\n");
+    fs::remove_all(root / "b");
+    const auto later = valuesOf(
+        bounded.createSamples(*subscribed.subscription, *subscribed.channels, *bounded.readChannels(all)).value());
+    EXPECT_EQ(later.at("a"), 2);
+    EXPECT_THAT(later, testing::Not(testing::Contains(testing::Key("b"))));
+    EXPECT_THAT(log.lines("kerl"), SizeIs(1)) << "of the bound";
 }
 
 // Then its absence from the first sample proves nothing: its content may be older.

@@ -33,7 +33,7 @@ protected:
     }
     [[nodiscard]] std::vector<ReportingChannel> read(const ChannelSelection& selection = {}) const
     {
-        return SoundCards(root).read(selection);
+        return SoundCards(root).read({selection});
     }
     // The channel of that place, which must exist.
     [[nodiscard]] ReportingChannel channel(const std::string& place) const
@@ -63,7 +63,7 @@ protected:
 TEST_F(SoundCardsTest, AreNoneWhereTheKernelKnowsNone)
 {
     EXPECT_THAT(read(), IsEmpty());
-    EXPECT_THAT(SoundCards("").read({}), IsEmpty());
+    EXPECT_THAT(SoundCards("").read({{}}), IsEmpty());
     fs::create_directories(root);
     support::writeFile(root / "cards", "--- no soundcards ---\n");
     EXPECT_THAT(read(), IsEmpty());

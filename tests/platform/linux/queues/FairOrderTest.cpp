@@ -215,6 +215,42 @@ TEST_F(FairOrderTest, ALaneIsFullWith512ItemsAndHasRoomAgainWith256)
     order.charge(1ms);
 }
 
+TEST_F(FairOrderTest, ALaneThatPausesWaitsForNothingUntilItGoesOn)
+{
+    const Lane lane = order.makeLane(alice);
+    const Lane other = order.makeLane(alice);
+    order.add(lane, {[&](Turn&) { order.pause(*lane); }, true});
+    addMany(lane, "behind", 2);
+    serve(1ms);
+    EXPECT_EQ(order.waiting(), 0U);
+    EXPECT_EQ(order.pausing(), 1U);
+    EXPECT_EQ(order.heldBack(), 2U);
+    add(lane, "behind");
+    EXPECT_EQ(order.heldBack(), 3U);
+    add(other, "other");
+    EXPECT_FALSE(order.isContested());
+    EXPECT_THAT(serve(1ms), ElementsAre("other"));
+    order.resume(lane, {[this](Turn&) { ran.emplace_back("goes on"); }, true});
+    EXPECT_EQ(order.waiting(), 4U);
+    EXPECT_EQ(order.pausing() + order.heldBack(), 0U);
+    EXPECT_THAT(serve(1ms), ElementsAre("goes on"));
+    EXPECT_THAT(serve(1ms), ElementsAre("behind"));
+}
+
+TEST_F(FairOrderTest, ALaneThatGoesOnWhileItIsServedStaysInItsPlace)
+{
+    const Lane lane = order.makeLane(alice);
+    order.add(lane,
+              {[&](Turn&) {
+                   order.pause(*lane);
+                   order.resume(lane, {[this](Turn&) { ran.emplace_back("goes on"); }, true});
+               },
+               true});
+    serve(1ms);
+    EXPECT_THAT(serve(1ms), ElementsAre("goes on"));
+    EXPECT_EQ(order.waiting(), 0U);
+}
+
 TEST_F(FairOrderTest, ALaneThatIsGoneStillHasItsItemsRun)
 {
     add(order.makeLane(alice), "a");

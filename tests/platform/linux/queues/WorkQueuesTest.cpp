@@ -458,6 +458,25 @@ TEST_F(LanesTest, AFullLaneSaysOnceWhenItHasRoomAgain)
     EXPECT_EQ(ran.size(), 512U);
 }
 
+TEST_F(LanesTest, AQueueThatEndsWaitsForLanesThatPause)
+{
+    const auto elsewhere = queues.makeSerialQueue("com.quarn.kesto.test", {});
+    const auto lane = queue->makeLane(1000);
+    lane->submitLong([&](Turn&) {
+        begun->signal();
+        elsewhere->submit([this, resume = lane->pause()]() mutable {
+            mayGo->wait();
+            resume([this](Turn&) { ran.emplace_back("goes on"); });
+        });
+    });
+    submit(*lane, "behind");
+    begun->wait();
+    elsewhere->submit([] { });
+    go();
+    queue.reset();
+    EXPECT_EQ(ran, (std::vector<std::string>{"goes on", "behind"}));
+}
+
 TEST_F(LanesTest, AHelperServesLanesInTheSameOrder)
 {
     const auto flood = queue->makeLane(1000);
