@@ -225,9 +225,10 @@ std::uint64_t Kestod::eventCount() const
     return *count;
 }
 
-std::vector<StoreRow> Kestod::waitForEvents(std::string_view pattern) const
+std::vector<StoreRow> Kestod::waitForEvents(std::string_view pattern, std::size_t count) const
 {
-    waitUntil([&] { return !readEvents(pattern).value_or(std::vector<StoreRow>()).empty(); }); // no store exists yet
+    constexpr std::vector<StoreRow> noStoreYet;
+    waitUntil([&] { return readEvents(pattern).value_or(noStoreYet).size() >= count; });
     return events(pattern);
 }
 

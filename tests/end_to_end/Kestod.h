@@ -92,8 +92,8 @@ public:
     [[nodiscard]] std::vector<std::string> query(const std::string& sql) const;
     // How many events the store holds. Throws if it cannot be read.
     [[nodiscard]] std::uint64_t eventCount() const;
-    // Waits for such an event.
-    [[nodiscard]] std::vector<StoreRow> waitForEvents(std::string_view pattern) const;
+    // Waits for at least so many such events.
+    [[nodiscard]] std::vector<StoreRow> waitForEvents(std::string_view pattern, std::size_t count = 1) const;
 
 private:
     [[nodiscard]] std::expected<std::vector<StoreRow>, std::string> readEvents(std::string_view pattern) const;
