@@ -216,7 +216,7 @@ void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t
         const auto session = reporterID == 0 ? nullptr : self.findReportingSessionForID(reporterID, false);
         if (!session || session->started() || !delegate)
             return reply(turn, std::nullopt, true);
-        start(turn, *delegate, session, reply);
+        self.start(turn, *delegate, session, reply);
     });
 }
 
@@ -246,7 +246,7 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
         const auto session = self.findReportingSessionForID(reporterID, false);
         const auto delegate = self.delegate_.lock();
         if (session && session->started() && delegate)
-            stop(turn, *delegate, session);
+            self.stop(turn, *delegate, session);
         KESTO_LOG(KestoReportingClientCategory(), Default, "stopping {}", reporterID);
         reply(turn, std::nullopt, true);
     });
@@ -343,24 +343,7 @@ void KestoReportingClientServerInstance::handleConnectionError()
 
 void KestoReportingClientServerInstance::logActiveSessions(KestoReportingServiceDelegateProtocol& delegate)
 {
-    const auto active = delegate.getAllActiveReportingSessions();
+    const auto active = delegate.getAllActiveReportingSessions(listAllowance_);
     KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
-              delegate.activeSessionCount(), client::descriptionOfSessions(active));
-}
-
-std::string client::descriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions)
-{
-    constexpr std::size_t longest = std::size_t{24} << 10; // roughly what one log line shows
-    std::vector<foundation::Value> descriptions;
-    std::size_t length = 0;
-    for (const auto& session : sessions) {
-        if (length > longest) {
-            descriptions.emplace_back(foundation::format("... {} more", sessions.size() - descriptions.size()));
-            break;
-        }
-        const std::string description = session->description();
-        length += description.size();
-        descriptions.emplace_back(description);
-    }
-    return foundation::Value(foundation::Array(std::move(descriptions))).text();
+              delegate.activeSessionCount(), listAllowance_.describe(active));
 }

@@ -43,7 +43,7 @@ public:
     [[nodiscard]] std::optional<foundation::Dictionary> getFeaturesState() override;
     [[nodiscard]] const Clients& getAllClients() const override { return clients_; }
     [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
-    [[nodiscard]] Sessions getAllActiveReportingSessions() override;
+    [[nodiscard]] Sessions getAllActiveReportingSessions(client::ListAllowance& allowance) override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
     [[nodiscard]] session::DriverSnapShot getSnapShot() override { return driverUtility_->getSnapShot(); }
     void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session) override
