@@ -31,8 +31,7 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
     : processIdentifier_(processIdentifier),
       userIdentifier_(userIdentifier),
       delegate_(std::move(delegate)),
-      budget_(std::make_shared<session::StorageBudget>(session::StorageBudget::clientLimit,
-                                                       session::StorageBudget::service()))
+      budget_(session::StorageBudget::makeForClient(userIdentifier))
 {
     KESTO_LOG(KestoReportingClientCategory(), Default, "new client with pid {}", processIdentifier_);
 }

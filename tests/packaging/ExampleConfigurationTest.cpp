@@ -1,4 +1,5 @@
 // The example configuration files are correct, and hold only the defaults.
+#include "platform/linux/memory/MemoryConfiguration.h"
 #include "platform/linux/settings/TomlFile.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
 
@@ -37,6 +38,21 @@ TEST(ExampleConfiguration, AnalyticsShowsEveryDefault)
     EXPECT_THAT(checked.problems, IsEmpty());
     EXPECT_EQ(checked.configuration, AnalyticsConfiguration());
     EXPECT_EQ(values.size(), 4U) << "a key that the example does not show";
+}
+
+TEST(ExampleConfiguration, LimitsShowEveryDefaultAndTheMostMemory)
+{
+    constexpr std::size_t largeMachine = std::size_t{64} << 30;
+    const std::string text = textOf("limits.toml");
+    const Dictionary values = parsed(text);
+    const auto defaults = readMemoryLimits({}, largeMachine);
+    const auto checked = readMemoryLimits(values, largeMachine);
+    EXPECT_THAT(checked.problems, IsEmpty());
+    EXPECT_EQ(checked.limits, defaults.limits);
+    EXPECT_EQ(values.size(), 2U);
+    const Dictionary withMemory = parsed(std::regex_replace(text, std::regex("\n# memory_mb"), "\nmemory_mb"));
+    EXPECT_EQ(withMemory.size(), 3U) << "a key that the example does not show";
+    EXPECT_EQ(readMemoryLimits(withMemory, 0).limits, defaults.limits);
 }
 
 TEST(ExampleConfiguration, DeviceAndFeaturesAreOffAsWithoutAFile)

@@ -1,4 +1,4 @@
-// Counts the freed bytes that the service reports.
+// Counts the freed bytes that the service reports, and has the limits that a test sets.
 #pragma once
 
 #include "platform/Memory.h"
@@ -9,10 +9,14 @@ namespace support {
 class FakeMemory final : public platform::Memory {
 public:
     void letGo(std::size_t bytes) override { bytes_ += bytes; }
+    [[nodiscard]] platform::MemoryLimits limits() const override { return limits_; }
     [[nodiscard]] std::size_t bytesLetGo() const { return bytes_; }
+    void setLimits(const platform::MemoryLimits& limits) { limits_ = limits; }
 
 private:
     std::size_t bytes_ = 0;
+    platform::MemoryLimits limits_{
+        .ofTheService = std::size_t{2} << 30, .ofAUser = std::size_t{2} << 30, .ofAClient = std::size_t{1} << 30};
 };
 
 } // namespace support

@@ -1,4 +1,5 @@
-// Freed memory returns to the system some seconds later.
+// The room of memory: how much of it what clients send may take, and how freed memory returns to the system. It reads
+// limits.toml and asks the threads' heaps to tidy up. It does not know what the memory is used for.
 //
 // An allocator keeps freed memory for the next request, and returns it to the system only in the course of later
 // requests: a service that falls idle after a long session would keep that session's memory for ever. It returns after
@@ -8,6 +9,7 @@
 
 #include "platform/Memory.h"
 #include "platform/WorkQueue.h"
+#include "platform/linux/settings/WatchedTomlFile.h"
 
 #include <atomic>
 #include <chrono>
@@ -22,13 +24,22 @@ public:
     // From the moment when `much` bytes are free until the heaps are tidied.
     static constexpr std::chrono::seconds delay{5};
 
-    explicit LinuxMemory(WorkQueues& queues) : queues_(queues) { }
+    // limits.toml in the configuration directory has the limits; the log reports wrong values in it.
+    LinuxMemory(WorkQueues& queues, ConfigurationWatcher& watcher, ProviderLog log);
 
     void letGo(std::size_t bytes) override;
+    [[nodiscard]] MemoryLimits limits() const override;
 
 private:
+    void applyLimits();
+
     WorkQueues& queues_;
+    const ProviderLog log_;
     std::atomic<std::size_t> bytes_ = 0; // since the heaps were last tidied
+    std::atomic<std::size_t> mostOfTheService_ = 0;
+    std::atomic<std::size_t> mostOfAUser_ = 0;
+    std::atomic<std::size_t> mostOfAClient_ = 0;
+    WatchedTomlFile limitsFile_; // destroyed first
 };
 
 } // namespace platform
