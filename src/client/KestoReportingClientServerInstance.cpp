@@ -39,8 +39,10 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
 KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
 {
     sessionsOfTheService -= clientReportingSessionMap_.size();
-    if (platform::isInstalled())
+    if (platform::isInstalled()) {
         platform::current().ledger.count(Counter::SessionsGone, clientReportingSessionMap_.size());
+        platform::current().memory.clientGone();
+    }
     if (sessionsRefused_ != 0)
         KESTO_LOG(KestoReportingClientCategory(), Error,
                   "client {} was refused {} sessions: it may have {}, and all clients {}", processIdentifier_,

@@ -84,6 +84,8 @@ void StorageShare::shrink(std::size_t bytes)
 {
     budget_->giveBack(bytes);
     bytes_ -= bytes;
+    if (bytes != 0 && platform::isInstalled())
+        platform::current().memory.letGo(bytes);
 }
 
 } // namespace session

@@ -53,11 +53,12 @@ private:
     std::atomic<std::size_t> taken_{0};
 };
 
-// What was paid for one thing that is kept. Its destructor returns it to the budget. One thread at a time.
+// What was paid for one thing that is kept. Its destructor returns it to the budget. The platform's memory gets to know
+// what is returned. One thread at a time.
 class StorageShare {
 public:
     explicit StorageShare(std::shared_ptr<StorageBudget> budget) : budget_(std::move(budget)) { }
-    ~StorageShare() { budget_->giveBack(bytes_); }
+    ~StorageShare() { shrink(bytes_); }
     StorageShare(const StorageShare&) = delete;
     StorageShare& operator=(const StorageShare&) = delete;
 

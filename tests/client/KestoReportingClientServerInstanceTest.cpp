@@ -76,6 +76,7 @@ TEST_F(ClientServerInstanceTest, SaysThatItGoes)
     EXPECT_THAT(lines(),
                 ElementsAre(IsLine(Default, "kerc", "new client with pid 17"),
                             IsLine(Default, "kerc", "dealloc 17 from the server client list")));
+    EXPECT_EQ(platform.memory.clientsGone(), 1);
 }
 
 TEST_F(ClientServerInstanceTest, DoesNothingOnTheCallersThreadButSubmit)

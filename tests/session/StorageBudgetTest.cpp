@@ -110,6 +110,19 @@ TEST_F(PlatformBudgetTest, FollowsLimitsThatChange)
 
 // --- shares
 
+TEST(StorageShare, TellsThePlatformWhatIsFree)
+{
+    support::TestPlatform platform;
+    {
+        session::StorageShare share(std::make_shared<session::StorageBudget>(100));
+        EXPECT_TRUE(share.grow(60));
+        EXPECT_EQ(platform.memory.bytesLetGo(), 0U);
+        EXPECT_TRUE(share.resize(50));
+        EXPECT_EQ(platform.memory.bytesLetGo(), 10U);
+    }
+    EXPECT_EQ(platform.memory.bytesLetGo(), 60U);
+}
+
 TEST(StorageShare, GrowsAndShrinksWithWhatItPaysForAndGivesAllBackInTheEnd)
 {
     const auto budget = std::make_shared<session::StorageBudget>(100);

@@ -6,21 +6,34 @@
 #include "platform/linux/queues/ThreadHeap.h"
 #include "platform/linux/settings/CheckedSettings.h"
 
+#include <fstream>
 #include <unistd.h>
 
 namespace platform {
 namespace {
 
-std::size_t bytesOfThisMachine()
+std::size_t bytesOfPages(long pages)
 {
-    return static_cast<std::size_t>(::sysconf(_SC_PHYS_PAGES)) * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE));
+    return static_cast<std::size_t>(pages) * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE));
 }
 
 } // namespace
 
-LinuxMemory::LinuxMemory(WorkQueues& queues, ConfigurationWatcher& watcher, ProviderLog log)
+// 0 if the system does not tell.
+std::size_t LinuxMemory::residentBytes()
+{
+    std::ifstream statm("/proc/self/statm");
+    long mapped = 0;
+    long resident = 0;
+    statm >> mapped >> resident;
+    return bytesOfPages(resident);
+}
+
+LinuxMemory::LinuxMemory(WorkQueues& queues, ConfigurationWatcher& watcher, ProviderLog log, std::size_t (*resident)())
     : queues_(queues),
       log_(log),
+      resident_(resident),
+      residentWhenTidy_(resident()),
       limitsFile_(watcher, "limits.toml", log, [this] { applyLimits(); })
 {
     applyLimits();
@@ -28,7 +41,7 @@ LinuxMemory::LinuxMemory(WorkQueues& queues, ConfigurationWatcher& watcher, Prov
 
 void LinuxMemory::applyLimits()
 {
-    const auto [limits, problems] = readMemoryLimits(limitsFile_.values(), bytesOfThisMachine());
+    const auto [limits, problems] = readMemoryLimits(limitsFile_.values(), bytesOfPages(::sysconf(_SC_PHYS_PAGES)));
     mostOfTheService_ = limits.ofTheService;
     mostOfAUser_ = limits.ofAUser;
     mostOfAClient_ = limits.ofAClient;
@@ -47,10 +60,23 @@ void LinuxMemory::letGo(std::size_t bytes)
     const std::size_t before = bytes_.fetch_add(bytes);
     if (before >= much || bytes < much - before)
         return;
-    queues_.submitAfter(delay, queues_.backgroundQueue(), [this] {
-        bytes_ = 0;
-        ThreadHeap::askAll();
-    });
+    queues_.submitAfter(delay, queues_.backgroundQueue(), [this] { tidy(); });
+}
+
+// The client's memory may not be free yet. It is in the process's, and it will be free when the heaps are tidied.
+void LinuxMemory::clientGone()
+{
+    const std::size_t before = residentWhenTidy_;
+    const std::size_t now = resident_();
+    if (now > before && now - before >= much)
+        letGo(now - before);
+}
+
+void LinuxMemory::tidy()
+{
+    bytes_ = 0;
+    ThreadHeap::askAll();
+    queues_.submitAfter(timeToTidy, queues_.backgroundQueue(), [this] { residentWhenTidy_ = resident_(); });
 }
 
 } // namespace platform

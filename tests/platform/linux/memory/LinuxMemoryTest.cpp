@@ -18,8 +18,12 @@ using namespace std::chrono_literals;
 
 constexpr std::size_t megabyte = std::size_t{1} << 20;
 
+std::size_t megabytesOfTheProcess = 0;
+
 class LinuxMemoryTest : public testing::Test {
 protected:
+    LinuxMemoryTest() { megabytesOfTheProcess = 20; }
+
     // Waits until the condition holds; false if the time is over.
     template <typename Condition> [[nodiscard]] static bool becomesTrue(Condition condition)
     {
@@ -37,7 +41,7 @@ protected:
     ConfigurationWatcher watcher{directory.path(), ProviderLog(log)};
     support::FakeClock clock;
     support::FakeWorkQueues queues{clock};
-    LinuxMemory memory{queues, watcher, ProviderLog(log)};
+    LinuxMemory memory{queues, watcher, ProviderLog(log), [] { return megabytesOfTheProcess * megabyte; }};
     int wakings = 0;
     ThreadHeap heap{[this] { ++wakings; }};
 };
@@ -77,7 +81,7 @@ TEST_F(LinuxMemoryTest, WakesThemOnceForAllThatWasLetGoMeanwhile)
 TEST_F(LinuxMemoryTest, CountsAnewOnceTheyWereWoken)
 {
     memory.letGo(100 * megabyte);
-    queues.advance(5s);
+    queues.advance(6s);
     memory.letGo(4 * megabyte - 1);
     EXPECT_TRUE(queues.delayed().empty());
     memory.letGo(1);
@@ -90,6 +94,39 @@ TEST_F(LinuxMemoryTest, IsNotFooledByEnormousNumbers)
     memory.letGo(1);
     memory.letGo(std::numeric_limits<std::size_t>::max() - 1);
     EXPECT_EQ(queues.delayed().size(), 1U);
+}
+
+TEST_F(LinuxMemoryTest, WakesThemAfterAClientWithWhichTheProcessBecameMuchLarger)
+{
+    megabytesOfTheProcess = 23;
+    memory.clientGone();
+    EXPECT_TRUE(queues.delayed().empty()) << "an idle service does not wake";
+    megabytesOfTheProcess = 24;
+    memory.clientGone();
+    memory.clientGone();
+    queues.advance(5s);
+    EXPECT_EQ(wakings, 1);
+}
+
+TEST_F(LinuxMemoryTest, ComparesWithTheSizeOnceTheThreadsHaveTidied)
+{
+    megabytesOfTheProcess = 100;
+    memory.clientGone();
+    queues.advance(5s);
+    megabytesOfTheProcess = 60; // of clients that are still there
+    queues.advance(1s);
+    megabytesOfTheProcess = 63;
+    memory.clientGone();
+    EXPECT_TRUE(queues.delayed().empty());
+    megabytesOfTheProcess = 64;
+    memory.clientGone();
+    EXPECT_EQ(queues.delayed().size(), 1U);
+}
+
+TEST_F(LinuxMemoryTest, KnowsTheSizeOfThisProcess)
+{
+    EXPECT_GT(LinuxMemory::residentBytes(), megabyte);
+    EXPECT_LT(LinuxMemory::residentBytes(), 4096 * megabyte);
 }
 
 // --- the limits
