@@ -227,6 +227,9 @@ private:
     };
     class Memory final : public platform::Memory {
         void letGo(std::size_t) override { }
+        void clientGone() override { }
+        [[nodiscard]] platform::MemoryLimits limits() const override { return {most, most, most}; }
+        static constexpr std::size_t most = std::size_t{2} << 30;
     };
 
     Log log_;

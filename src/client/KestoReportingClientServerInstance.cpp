@@ -31,8 +31,7 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
     : processIdentifier_(processIdentifier),
       userIdentifier_(userIdentifier),
       delegate_(std::move(delegate)),
-      budget_(std::make_shared<session::StorageBudget>(session::StorageBudget::clientLimit,
-                                                       session::StorageBudget::service()))
+      budget_(session::StorageBudget::makeForClient(userIdentifier))
 {
     KESTO_LOG(KestoReportingClientCategory(), Default, "new client with pid {}", processIdentifier_);
 }
@@ -40,8 +39,10 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
 KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
 {
     sessionsOfTheService -= clientReportingSessionMap_.size();
-    if (platform::isInstalled())
+    if (platform::isInstalled()) {
         platform::current().ledger.count(Counter::SessionsGone, clientReportingSessionMap_.size());
+        platform::current().memory.clientGone();
+    }
     if (sessionsRefused_ != 0)
         KESTO_LOG(KestoReportingClientCategory(), Error,
                   "client {} was refused {} sessions: it may have {}, and all clients {}", processIdentifier_,
@@ -219,7 +220,7 @@ void KestoReportingClientServerInstance::startReportingSessionForID(std::int64_t
         self.withDriverMoment(turn, *delegate,
                               [session, reply](auto& client, platform::Turn& later, const auto& moment) {
                                   if (const auto service = client.delegate_.lock())
-                                      start(later, *service, session, moment, reply);
+                                      client.start(later, *service, session, moment, reply);
                                   else
                                       reply(later, std::nullopt, true);
                               });
@@ -261,7 +262,7 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
         self.withDriverMoment(turn, *delegate,
                               [session, finish](auto& client, platform::Turn& later, const auto& moment) {
                                   if (const auto service = client.delegate_.lock())
-                                      stop(later, *service, session, moment);
+                                      client.stop(later, *service, session, moment);
                                   finish(later);
                               });
     });
@@ -358,24 +359,7 @@ void KestoReportingClientServerInstance::handleConnectionError()
 
 void KestoReportingClientServerInstance::logActiveSessions(KestoReportingServiceDelegateProtocol& delegate)
 {
-    const auto active = delegate.getAllActiveReportingSessions();
+    const auto active = delegate.getAllActiveReportingSessions(listAllowance_);
     KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
-              delegate.activeSessionCount(), client::descriptionOfSessions(active));
-}
-
-std::string client::descriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions)
-{
-    constexpr std::size_t longest = std::size_t{24} << 10; // roughly what one log line shows
-    std::vector<foundation::Value> descriptions;
-    std::size_t length = 0;
-    for (const auto& session : sessions) {
-        if (length > longest) {
-            descriptions.emplace_back(foundation::format("... {} more", sessions.size() - descriptions.size()));
-            break;
-        }
-        const std::string description = session->description();
-        length += description.size();
-        descriptions.emplace_back(description);
-    }
-    return foundation::Value(foundation::Array(std::move(descriptions))).text();
+              delegate.activeSessionCount(), listAllowance_.describe(active));
 }

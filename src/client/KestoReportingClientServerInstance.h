@@ -6,6 +6,7 @@
 
 #include "client/KestoReportingServiceDelegateProtocol.h"
 #include "client/KestoReportingServiceProtocol.h"
+#include "client/ListAllowance.h"
 #include "client/SessionMap.h"
 #include "foundation/Mutex.h"
 #include "session/StorageBudget.h"
@@ -115,10 +116,10 @@ private:
             });
         });
     }
-    static void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
-                      const session::DriverMoment& moment, const SuccessReply& reply);
-    static void stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
-                     const session::DriverMoment& moment);
+    void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
+               const session::DriverMoment& moment, const SuccessReply& reply);
+    void stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
+              const session::DriverMoment& moment);
     void deliverToReporters(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
                             const Message& message, const ReporterIDs& reporterIDs);
     void deliverToActiveSessions(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
@@ -132,7 +133,7 @@ private:
                                const Message& message, const Session& session);
     static void deliverToSession(platform::Turn& turn, const Message& message, const Session& session);
     [[nodiscard]] ledger::Culprit culprit() const;
-    static void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
+    void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
     void addSession(platform::Turn& turn, std::int64_t reporterID, Session session);
     void removeSession(platform::Turn& turn, std::int64_t reporterID);
 
@@ -146,15 +147,9 @@ private:
     const std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate_;
 
     std::shared_ptr<session::StorageBudget> budget_;
+    client::ListAllowance listAllowance_;
     std::uint64_t sessionsRefused_ = 0;
     std::uint64_t receiversRefused_ = 0;
     std::atomic<bool> isConnectionLost_ = false;
     mutable foundation::Mutex registrationLock_;
 };
-
-namespace client {
-
-// The sessions' descriptions as one text for the log; further ones are left out when a log line is full.
-[[nodiscard]] std::string descriptionOfSessions(const KestoReportingServiceDelegateProtocol::Sessions& sessions);
-
-} // namespace client

@@ -31,7 +31,7 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
                                       std::move(processName).value_or("(null)"), source_},
                     reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
         KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
-                  reporterIDs ? foundation::format("[{}]", foundation::join(*reporterIDs, ",")) : "(null)");
+                  reporterIDs ? self.listAllowance_.describe(*reporterIDs) : "(null)");
         utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
         const auto delegate = self.delegate_.lock();
         if (!delegate)
@@ -75,9 +75,9 @@ void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn&
                                                                  KestoReportingServiceDelegateProtocol& delegate,
                                                                  const Message& message)
 {
-    const auto active = delegate.getAllActiveReportingSessions();
+    const auto active = delegate.getAllActiveReportingSessions(listAllowance_);
     KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active.size(),
-              client::descriptionOfSessions(active));
+              listAllowance_.describe(active));
     const std::size_t receivers = std::min(active.size(), mostReceivers(message, active.size()));
     countRefusedReceivers(turn.tally, message, active.size() - receivers);
     for (const auto& session : std::span(active).first(receivers)) {

@@ -1,6 +1,7 @@
 // What a client object may ask of the one service object.
 #pragma once
 
+#include "client/ListAllowance.h"
 #include "foundation/values/Value.h"
 #include "session/KestoReportingSession.h"
 
@@ -28,8 +29,9 @@ public:
     // The connected clients in the order of registration: the registry itself, not a copy.
     [[nodiscard]] virtual const Clients& getAllClients() const = 0;
     [[nodiscard]] virtual bool isReportingEnabled() const = 0;
-    // The started sessions of all clients, in the order of registration and then of creation.
-    [[nodiscard]] virtual Sessions getAllActiveReportingSessions() = 0;
+    // The started sessions of all clients, in the order of registration and then of creation. Logs those of each client
+    // as far as the caller's allowance lasts.
+    [[nodiscard]] virtual Sessions getAllActiveReportingSessions(client::ListAllowance& allowance) = 0;
     // The session of that ID that belongs to the client registered first, or null.
     [[nodiscard]] virtual std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) = 0;
     // Whether the next two need the drivers' channels, which `readDriverMoment` reads on another thread and gives to

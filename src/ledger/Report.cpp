@@ -86,6 +86,14 @@ Dictionary now(const Account& sinceStart)
     return {{"connections", connections}, {"sessions", sessions}};
 }
 
+Dictionary memory(const MemoryState& state)
+{
+    return {{"used", state.used},
+            {"limit", state.limit},
+            {"limitOfAUser", state.limitOfAUser},
+            {"limitOfAClient", state.limitOfAClient}};
+}
+
 Dictionary whole(Dictionary::Entries head, const Account& account, bool withCulprits, Value sinceStart)
 {
     Dictionary::Entries entries = std::move(head);
@@ -116,15 +124,21 @@ Dictionary report(const Ledger& ledger, const ServiceProcess& process, bool with
                   {"internalBuild", process.isInternalBuild},
                   {"started", seconds(process.started)},
                   {"now", now(sinceStart)},
-                  {"rates", Dictionary{{"deliveries", deliveries}, {"events", events}}}},
+                  {"rates", Dictionary{{"deliveries", deliveries}, {"events", events}}},
+                  {"memory", memory(process.memory())}},
                  ledger.account(), withCulprits, Dictionary(counts(sinceStart, withCulprits)));
 }
 
 Dictionary report(const Account& account, bool withCulprits)
 {
-    return whole(
-        {{"running", false}, {"version", {}}, {"internalBuild", {}}, {"started", {}}, {"now", {}}, {"rates", {}}},
-        account, withCulprits, {});
+    return whole({{"running", false},
+                  {"version", {}},
+                  {"internalBuild", {}},
+                  {"started", {}},
+                  {"now", {}},
+                  {"rates", {}},
+                  {"memory", {}}},
+                 account, withCulprits, {});
 }
 
 } // namespace ledger

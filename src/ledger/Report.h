@@ -13,11 +13,20 @@
 
 namespace ledger {
 
+// How much memory what clients send takes at the moment, and may take, in bytes.
+struct MemoryState {
+    std::uint64_t used = 0;
+    std::uint64_t limit = 0;
+    std::uint64_t limitOfAUser = 0;
+    std::uint64_t limitOfAClient = 0;
+};
+
 // The process that counts.
 struct ServiceProcess {
     std::string_view version;
     bool isInternalBuild = false;
     double started = 0; // seconds since 1970
+    MemoryState (*memory)() = [] { return MemoryState(); };
 };
 
 // What is open, by the counts since the start of the process.

@@ -107,7 +107,8 @@ void KestoReportingServiceDelegate::reporterIDRemoved(std::int64_t reporterID,
     reporterIndex_.remove(reporterID, client);
 }
 
-KestoReportingServiceDelegateProtocol::Sessions KestoReportingServiceDelegate::getAllActiveReportingSessions()
+KestoReportingServiceDelegateProtocol::Sessions
+KestoReportingServiceDelegate::getAllActiveReportingSessions(client::ListAllowance& allowance)
 {
     utility::assertServerQueue();
     Sessions active;
@@ -116,7 +117,7 @@ KestoReportingServiceDelegateProtocol::Sessions KestoReportingServiceDelegate::g
         for (const auto& entry : client->clientReportingSessionMap())
             sessions.push_back(entry.session);
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "sessions for client {} : {}",
-                  client->processIdentifier(), client::descriptionOfSessions(sessions));
+                  client->processIdentifier(), allowance.describe(sessions));
         std::erase_if(sessions, [](const auto& session) { return !session->started(); });
         active.insert(active.end(), sessions.begin(), sessions.end());
     }

@@ -44,7 +44,7 @@ public:
     [[nodiscard]] std::optional<foundation::Dictionary> getFeaturesState() override;
     [[nodiscard]] const Clients& getAllClients() const override { return clients_; }
     [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
-    [[nodiscard]] Sessions getAllActiveReportingSessions() override;
+    [[nodiscard]] Sessions getAllActiveReportingSessions(client::ListAllowance& allowance) override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
     [[nodiscard]] bool needsDriverMoments() const override { return driverUtility_->needsMoments(); }
     void readDriverMoment(std::move_only_function<void(session::DriverMoment moment)> take) override

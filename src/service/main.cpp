@@ -8,6 +8,7 @@
 #include "platform/linux/process/ServiceManager.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "service/StatusNotifier.h"
+#include "session/StorageBudget.h"
 #include "tracing/TraceRunner.h"
 #include "utility/EndProcess.h"
 #include "utility/KestoReportingUtility.h"
@@ -59,6 +60,15 @@ void logEnd(const std::string& request)
     platform::notifyStopping("ending: " + request);
 }
 
+ledger::MemoryState memoryState()
+{
+    const platform::MemoryLimits limits = platform::current().memory.limits();
+    return {.used = session::StorageBudget::service()->taken(),
+            .limit = limits.ofTheService,
+            .limitOfAUser = limits.ofAUser,
+            .limitOfAClient = limits.ofAClient};
+}
+
 int run()
 {
     platform::EndSignals endSignals; // first, because every thread must block them
@@ -80,7 +90,8 @@ int run()
     (*listener)->setDelegate(*service);
     const ledger::ServiceProcess process{.version = KESTO_VERSION,
                                          .isInternalBuild = KestoReportingUtilityIsInternalBuild(),
-                                         .started = platform.platform().clock.secondsSince1970()};
+                                         .started = platform.platform().clock.secondsSince1970(),
+                                         .memory = memoryState};
     (*listener)->setStatus([&ledger = platform.platform().ledger, process](bool withCulprits) {
         return ledger::report(ledger, process, withCulprits);
     });

@@ -24,6 +24,9 @@ std::string applicationText(const foundation::Dictionary& configuration)
         foundation::cutBetweenCharacters(KestoReportingUtilityRetrieveAppName(configuration).text(), longest));
 }
 
+// What a session takes besides what it has paid for, roughly: itself, and its places in the maps of sessions.
+constexpr std::size_t bytesOfASession = sizeof(KestoReportingSession) + 256;
+
 // What a snapshot takes, roughly.
 std::size_t roughBytes(const session::DriverSnapShot& snapShot)
 {
@@ -59,7 +62,8 @@ KestoReportingSession::~KestoReportingSession()
 {
     utility::emitTraceCode(utility::ServiceTraceCode::SessionDestroyed);
     KESTO_LOG(KestoReportingSessionCategory(), Info, "deallocing this session {}", reporterID_);
-    letGoOfMessages();
+    if (platform::isInstalled())
+        platform::current().memory.letGo(bytesOfASession);
 }
 
 std::string KestoReportingSession::description() const
@@ -211,11 +215,7 @@ void KestoReportingSession::stop(platform::Turn& turn)
 void KestoReportingSession::letGoOfMessages()
 {
     const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    if (!nestedAggregatedPayloadData_)
-        return;
-    const std::size_t bytes = nestedAggregatedPayloadData_->bytes();
     nestedAggregatedPayloadData_.reset();
-    platform::current().memory.letGo(bytes);
 }
 
 // The caller reads the store without the lock, under which recorders would wait for a disk. This is safe: the thread

@@ -359,7 +359,7 @@ public:
     MOCK_METHOD(std::optional<Dictionary>, getFeaturesState, (), (override));
     MOCK_METHOD(const Clients&, getAllClients, (), (const, override));
     MOCK_METHOD(bool, isReportingEnabled, (), (const, override));
-    MOCK_METHOD(Sessions, getAllActiveReportingSessions, (), (override));
+    MOCK_METHOD(Sessions, getAllActiveReportingSessions, (client::ListAllowance&), (override));
     MOCK_METHOD(std::shared_ptr<KestoReportingSession>, findReportingSessionForID, (std::int64_t), (override));
     MOCK_METHOD(bool, needsDriverMoments, (), (const, override));
     MOCK_METHOD(void, readDriverMoment, (std::move_only_function<void(session::DriverMoment)>), (override));

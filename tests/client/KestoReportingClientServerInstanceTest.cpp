@@ -76,6 +76,7 @@ TEST_F(ClientServerInstanceTest, SaysThatItGoes)
     EXPECT_THAT(lines(),
                 ElementsAre(IsLine(Default, "kerc", "new client with pid 17"),
                             IsLine(Default, "kerc", "dealloc 17 from the server client list")));
+    EXPECT_EQ(platform.memory.clientsGone(), 1);
 }
 
 TEST_F(ClientServerInstanceTest, DoesNothingOnTheCallersThreadButSubmit)
@@ -795,26 +796,6 @@ TEST_F(ClientServerInstanceTest, DescribesNoMoreSessionsThanALogLineShows)
                     testing::Field("message", &LogLine::message,
                                    testing::AllOf(testing::StartsWith("sessions for client 1001 : [\"reporterID=1,"),
                                                   testing::EndsWith(" more\"]")))));
-}
-
-TEST_F(ClientServerInstanceTest, DescribesOneMoreSessionAfterExactly24KibibytesOfDescriptionsAndNoneAfterMore)
-{
-    constexpr std::size_t sessionsOf24Kibibytes = 96;
-    constexpr std::size_t bytesOfADescription = 256;
-    KestoReportingServiceDelegateProtocol::Sessions sessions;
-    const auto addSession = [&](std::int64_t reporterID) {
-        sessions.push_back(std::make_shared<KestoReportingSession>(reporterID, std::vector<std::int32_t>{1001}));
-        sessions.back()->setConfiguration(Dictionary{{"HostApplicationDisplayID", std::string(173, 'x')}});
-        ASSERT_EQ(sessions.back()->description().size(), bytesOfADescription);
-    };
-    for (std::size_t count = 0; count < sessionsOf24Kibibytes; ++count)
-        addSession(100);
-    addSession(201);
-    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::EndsWith("xxx,started=0\"]"));
-    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::HasSubstr("\"reporterID=201,"));
-    addSession(202);
-    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::HasSubstr("\"reporterID=201,"));
-    EXPECT_THAT(client::descriptionOfSessions(sessions), testing::EndsWith("xxx,started=0\",\"... 1 more\"]"));
 }
 
 // --- kill

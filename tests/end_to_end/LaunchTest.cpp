@@ -119,6 +119,7 @@ TEST(LaunchTest, BrokenConfigurationIsSaidAndTheServiceRunsWithoutIt)
 {
     Kestod kestod({{"analytics.toml", "used = [\n"},
                    {"device.toml", "InternalBuild = maybe\n"},
+                   {"limits.toml", "memory_mb = 0\n"},
                    {"preferences/com.quarn.kesto.toml", "= 1\n"}},
                   {{"KESTO_LOG", "default"}});
     kestod.start();
@@ -127,7 +128,7 @@ TEST(LaunchTest, BrokenConfigurationIsSaidAndTheServiceRunsWithoutIt)
     client.call(Start, 1);
     client.ask(SendMessage, foundation::Dictionary{{"a", 1}}, 4, 1, foundation::Array{1});
     EXPECT_EQ(kestod.events("com.quarn.kesto.Playback.Start").size(), 1U);
-    for (const std::string_view file : {"analytics.toml", "device.toml", "com.quarn.kesto.toml"})
+    for (const std::string_view file : {"analytics.toml", "device.toml", "limits.toml", "com.quarn.kesto.toml"})
         EXPECT_TRUE(kestod.waitForLog(file)) << file;
 }
 

@@ -5,6 +5,7 @@
 #include "support/MessageKinds.h"
 #include "support/Sanitizers.h"
 
+#include <deque>
 #include <fstream>
 #include <gtest/gtest.h>
 #include <optional>
@@ -92,21 +93,26 @@ protected:
         return std::chrono::milliseconds((user + system) * 1000 / ::sysconf(_SC_CLK_TCK));
     }
 
+    // Waits until the system has the memory again that the service did not have before.
+    void expectBack(double before) const
+    {
+        constexpr double mostMegabytes = 16;
+        constexpr std::chrono::seconds most(10);
+        const auto ended = std::chrono::steady_clock::now();
+        EXPECT_TRUE(waitUntil([&] { return megabytes("VmRSS") - before < mostMegabytes; }))
+            << megabytes("VmRSS") << " MB, and there were " << before;
+        EXPECT_LT(std::chrono::steady_clock::now() - ended, most);
+    }
     // Makes three sessions end, and waits until the system has their memory and the service sleeps again.
     template <typename End> void expectBackAfter(End endSession)
     {
         constexpr int changes = 60'000;
-        constexpr double mostMegabytes = 16;
-        constexpr std::chrono::seconds most(10);
         const double before = megabytes("VmRSS");
         for (int reporter = 2; reporter <= 4; ++reporter) {
             play(reporter, changes);
             endSession(reporter);
         }
-        const auto ended = std::chrono::steady_clock::now();
-        EXPECT_TRUE(waitUntil([&] { return megabytes("VmRSS") - before < mostMegabytes; }))
-            << megabytes("VmRSS") << " MB, and there were " << before;
-        EXPECT_LT(std::chrono::steady_clock::now() - ended, most);
+        expectBack(before);
         constexpr std::chrono::milliseconds watched(500);
         constexpr std::chrono::milliseconds mostOfIt(100);
         const auto worked = timeWorked();
@@ -139,6 +145,41 @@ TEST_F(MemoryTest, GoesBackToTheSystemSecondsAfterSessionsEnded)
 TEST_F(MemoryTest, GoesBackToTheSystemWhicheverThreadEndedTheSessions)
 {
     expectBackAfter([&](int reporter) { endInABurst(reporter); });
+}
+
+TEST_F(MemoryTest, GoesBackToTheSystemAfterClientsWithLargeConfigurationsGo)
+{
+    constexpr int configurations = 160; // more than the limits have room for
+    constexpr double muchOfThem = 64;
+    const double before = megabytes("VmRSS");
+    {
+        const Dictionary configuration{{"text", std::string(900'000, 'x')}};
+        std::deque<WireClient> clients;
+        for (int number = 2; number <= 4; ++number) {
+            WireClient& each = clients.emplace_back(kestod.socketPath());
+            for (int reporter = 1; reporter <= configurations; ++reporter) {
+                each.ask(Create, reporter);
+                each.ask(SetConfiguration, configuration, reporter);
+            }
+        }
+        EXPECT_GT(megabytes("VmRSS") - before, muchOfThem);
+    }
+    expectBack(before);
+}
+
+TEST_F(MemoryTest, GoesBackToTheSystemAfterClientsThatLeaveInTheMiddleOfAFrame)
+{
+    constexpr int count = 64;
+    constexpr double muchOfThem = 32;
+    const double before = megabytes("VmRSS");
+    {
+        std::deque<WireClient> clients;
+        for (int number = 0; number < count; ++number)
+            clients.emplace_back(kestod.socketPath())
+                .sendBytes(std::string{0, 0, 0x10, 0} + std::string(1'000'000, 'x')); // of 2^20 bytes
+        EXPECT_TRUE(waitUntil([&] { return megabytes("VmRSS") - before > muchOfThem; }));
+    }
+    expectBack(before);
 }
 
 } // namespace

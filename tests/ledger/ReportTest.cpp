@@ -15,7 +15,10 @@ using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
 
-constexpr ServiceProcess process{.version = "1.2.3", .isInternalBuild = true, .started = 1700000000.75};
+constexpr ServiceProcess process{.version = "1.2.3", .isInternalBuild = true, .started = 1700000000.75, .memory = [] {
+                                     return MemoryState{
+                                         .used = 5, .limit = 100, .limitOfAUser = 75, .limitOfAClient = 50};
+                                 }};
 
 // The value under keys within keys.
 Value at(const Dictionary& report, std::string_view path)
@@ -45,8 +48,8 @@ std::vector<std::string> keys(const Dictionary& dictionary)
 
 bool isOnlyOfTheWhole(const std::string& key)
 {
-    static const std::set<std::string> keys{"running", "version", "internalBuild", "started", "now",
-                                            "rates",   "began",   "store",         "stored",  "sinceStart"};
+    static const std::set<std::string> keys{"running", "version", "internalBuild", "started", "now",       "rates",
+                                            "memory",  "began",   "store",         "stored",  "sinceStart"};
     return keys.contains(key);
 }
 
@@ -55,10 +58,10 @@ TEST(Report, HasTheKeysThatProgramsReadInTheirOrder)
 {
     const Dictionary whole = report(Ledger(), process, true);
     const std::vector<std::string> expected{
-        "running",  "version",    "internalBuild", "started",     "now",       "rates",   "began",    "store",
-        "stored",   "deliveries", "recorded",      "repeated",    "inert",     "refused", "events",   "kept",
-        "unwanted", "lost",       "removed",       "connections", "frames",    "calls",   "sessions", "channels",
-        "captures", "traces",     "log",           "who",         "sinceStart"};
+        "running",  "version",  "internalBuild", "started",  "now",         "rates",     "memory",  "began",
+        "store",    "stored",   "deliveries",    "recorded", "repeated",    "inert",     "refused", "events",
+        "kept",     "unwanted", "lost",          "removed",  "connections", "frames",    "calls",   "sessions",
+        "channels", "captures", "traces",        "log",      "who",         "sinceStart"};
     std::vector<std::string> found = keys(whole);
     std::erase_if(found, [&](const std::string& key) { return std::ranges::find(expected, key) == expected.end(); });
     EXPECT_EQ(found, expected);
@@ -88,6 +91,7 @@ TEST(Report, SaysWhichProcessCountsAndSinceWhen)
     EXPECT_EQ(at(whole, "started").text(), "1700000000");
     EXPECT_EQ(at(whole, "began").text(), "1600000000");
     EXPECT_EQ(at(whole, "now").text(), R"({"connections":0,"sessions":0})");
+    EXPECT_EQ(at(whole, "memory").text(), R"({"used":5,"limit":100,"limitOfAUser":75,"limitOfAClient":50})");
     EXPECT_EQ(at(whole, "store").text(), R"({"events":0,"bytes":0,"oldest":null})");
 }
 
@@ -97,7 +101,7 @@ TEST(Report, WithoutAProcessHasNullForWhatOnlyAProcessHas)
     const Dictionary whole = report(*accountIn(image), false);
     EXPECT_EQ(at(whole, "running"), Value(false));
     EXPECT_EQ(at(whole, "began"), Value(1600000000));
-    for (const char* key : {"version", "internalBuild", "started", "now", "rates", "sinceStart"})
+    for (const char* key : {"version", "internalBuild", "started", "now", "rates", "memory", "sinceStart"})
         EXPECT_EQ(at(whole, key), Value()) << key;
 }
 

@@ -1,4 +1,5 @@
-// The example configuration files are correct, and hold only the defaults.
+// The example configuration files are correct, and hold only the defaults, with which the units agree.
+#include "platform/linux/memory/MemoryConfiguration.h"
 #include "platform/linux/settings/TomlFile.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
 
@@ -38,6 +39,45 @@ TEST(ExampleConfiguration, AnalyticsShowsEveryDefault)
     EXPECT_EQ(checked.configuration, AnalyticsConfiguration());
     EXPECT_EQ(values.size(), 4U) << "a key that the example does not show";
 }
+
+TEST(ExampleConfiguration, LimitsShowEveryDefaultAndTheMostMemory)
+{
+    constexpr std::size_t largeMachine = std::size_t{64} << 30;
+    const std::string text = textOf("limits.toml");
+    const Dictionary values = parsed(text);
+    const auto defaults = readMemoryLimits({}, largeMachine);
+    const auto checked = readMemoryLimits(values, largeMachine);
+    EXPECT_THAT(checked.problems, IsEmpty());
+    EXPECT_EQ(checked.limits, defaults.limits);
+    EXPECT_EQ(values.size(), 2U);
+    const Dictionary withMemory = parsed(std::regex_replace(text, std::regex("\n# memory_mb"), "\nmemory_mb"));
+    EXPECT_EQ(withMemory.size(), 3U) << "a key that the example does not show";
+    EXPECT_EQ(readMemoryLimits(withMemory, 0).limits, defaults.limits);
+}
+
+// --- the units
+
+// The number of megabytes of a setting of the service's unit.
+std::size_t megabytesIn(const std::string& unit, const std::string& setting)
+{
+    std::smatch found;
+    const bool isThere = std::regex_search(unit, found, std::regex("\n" + setting + "=([0-9]+)M\n"));
+    EXPECT_TRUE(isThere) << setting;
+    return isThere ? std::stoul(found[1]) : 0;
+}
+
+TEST(ServiceUnits, LeaveTheLargestDefaultItsRoomAndAsMuchBeside)
+{
+    for (const char* manager : {"system", "user"}) {
+        const std::string unit = textOf("../systemd/" + std::string(manager) + "/kestod.service.in");
+        const std::size_t high = megabytesIn(unit, "MemoryHigh");
+        EXPECT_EQ(high, 2 * (DefaultMemory::most >> 20)) << manager;
+        EXPECT_EQ(megabytesIn(unit, "MemoryMax"), high + high / 2) << manager;
+        EXPECT_NE(unit.find("\nLogRateLimitIntervalSec=60s\nLogRateLimitBurst=10000\n"), std::string::npos) << manager;
+    }
+}
+
+// --- the other examples
 
 TEST(ExampleConfiguration, DeviceAndFeaturesAreOffAsWithoutAFile)
 {

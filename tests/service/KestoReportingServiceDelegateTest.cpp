@@ -65,8 +65,9 @@ TEST(ServiceMaking, BeginsWithNoClients)
 {
     ServiceHarness harness;
     EXPECT_THAT(harness.service->getAllClients(), IsEmpty());
-    const auto active =
-        onServerQueue(harness.platform.workQueues, [&] { return harness.service->getAllActiveReportingSessions(); });
+    client::ListAllowance allowance;
+    const auto active = onServerQueue(harness.platform.workQueues,
+                                      [&] { return harness.service->getAllActiveReportingSessions(allowance); });
     EXPECT_THAT(active, IsEmpty());
 }
 
@@ -150,8 +151,10 @@ class ServiceTest : public testing::Test {
 protected:
     KestoReportingServiceDelegate::Sessions activeSessions()
     {
-        return onServerQueue(platform.workQueues, [&] { return service.getAllActiveReportingSessions(); });
+        return onServerQueue(platform.workQueues, [&] { return service.getAllActiveReportingSessions(allowance); });
     }
+
+    client::ListAllowance allowance;
 
     ServiceHarness harness;
     TestPlatform& platform = harness.platform;

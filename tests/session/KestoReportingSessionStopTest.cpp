@@ -311,6 +311,16 @@ TEST_F(SessionStop, TellsHowMuchMemoryItLetGo)
     EXPECT_LT(platform.memory.bytesLetGo(), 500'000U);
 }
 
+TEST_F(SessionStop, TellsItTooOfAConfigurationAndOfItselfWhenItGoes)
+{
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
+    session->setConfiguration(foundation::Dictionary{{"a", std::string(100'000, 'x')}});
+    const std::size_t before = platform.memory.bytesLetGo();
+    session.reset();
+    EXPECT_GT(platform.memory.bytesLetGo() - before, 100'000U + 400);
+    EXPECT_LT(platform.memory.bytesLetGo() - before, 110'000U);
+}
+
 TEST_F(SessionStop, TellsItTooOfASessionThatGoesWithoutAStop)
 {
     send(0, {{"a", std::string(100'000, 'x')}});

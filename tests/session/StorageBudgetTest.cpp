@@ -1,5 +1,7 @@
-// Neither one client nor all of them together may fill the device's memory with messages.
+// Neither one client nor one user nor all of them together may fill the device's memory with messages.
 #include "session/StorageBudget.h"
+
+#include "support/TestPlatform.h"
 
 #include <gtest/gtest.h>
 #include <limits>
@@ -51,9 +53,74 @@ TEST(StorageBudget, TakesFromTheEnclosingOneToo)
     EXPECT_EQ(whole->taken(), 30U);
 }
 
-TEST(StorageBudget, LeavesRoomForASecondClientWhenOneIsFull)
+// --- the limits of the platform
+
+class PlatformBudgetTest : public testing::Test {
+protected:
+    PlatformBudgetTest() { platform.memory.setLimits({.ofTheService = 100, .ofAUser = 75, .ofAClient = 50}); }
+
+    support::TestPlatform platform;
+};
+
+TEST_F(PlatformBudgetTest, LeavesRoomForAnotherClientAndForAnotherUser)
 {
-    EXPECT_GE(session::StorageBudget::serviceLimit, 2 * session::StorageBudget::clientLimit);
+    const auto first = session::StorageBudget::makeForClient(1000);
+    const auto second = session::StorageBudget::makeForClient(1000);
+    const auto ofAnother = session::StorageBudget::makeForClient(1001);
+    EXPECT_FALSE(first->take(51));
+    EXPECT_TRUE(first->take(50));
+    EXPECT_FALSE(second->take(26)) << "their user has 25 left";
+    EXPECT_TRUE(second->take(25));
+    EXPECT_FALSE(ofAnother->take(26)) << "the service has 25 left";
+    EXPECT_TRUE(ofAnother->take(25));
+    EXPECT_EQ(session::StorageBudget::service()->taken(), 100U);
+    first->giveBack(50);
+    second->giveBack(25);
+    ofAnother->giveBack(25);
+    EXPECT_EQ(session::StorageBudget::service()->taken(), 0U);
+}
+
+TEST_F(PlatformBudgetTest, CountsForAUserWhatItsClientsThatWentHaveNotGivenBackYet)
+{
+    auto gone = session::StorageBudget::makeForClient(1000);
+    const auto present = session::StorageBudget::makeForClient(1000);
+    {
+        session::StorageShare share(gone);
+        ASSERT_TRUE(share.grow(50));
+        gone.reset();
+        EXPECT_FALSE(present->take(26));
+    }
+    EXPECT_TRUE(present->take(50));
+    present->giveBack(50);
+}
+
+TEST_F(PlatformBudgetTest, FollowsLimitsThatChange)
+{
+    const auto client = session::StorageBudget::makeForClient(1000);
+    EXPECT_TRUE(client->take(50));
+    platform.memory.setLimits({.ofTheService = 40, .ofAUser = 30, .ofAClient = 20});
+    EXPECT_FALSE(client->take(1)) << "what was taken before stays";
+    client->giveBack(31);
+    EXPECT_TRUE(client->take(1));
+    EXPECT_FALSE(client->take(1));
+    platform.memory.setLimits({.ofTheService = 100, .ofAUser = 75, .ofAClient = 50});
+    EXPECT_TRUE(client->take(30));
+    client->giveBack(50);
+}
+
+// --- shares
+
+TEST(StorageShare, TellsThePlatformWhatIsFree)
+{
+    support::TestPlatform platform;
+    {
+        session::StorageShare share(std::make_shared<session::StorageBudget>(100));
+        EXPECT_TRUE(share.grow(60));
+        EXPECT_EQ(platform.memory.bytesLetGo(), 0U);
+        EXPECT_TRUE(share.resize(50));
+        EXPECT_EQ(platform.memory.bytesLetGo(), 10U);
+    }
+    EXPECT_EQ(platform.memory.bytesLetGo(), 60U);
 }
 
 TEST(StorageShare, GrowsAndShrinksWithWhatItPaysForAndGivesAllBackInTheEnd)

@@ -40,6 +40,7 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
                   ProviderLog(log_)),
       kernelTrace_(TracefsPlace(), traceEmitter_, emitterAccess_, ProviderLog(log_)),
       performanceWriter_(fileSystem_, ProviderLog(log_)),
+      memory_(workQueues_, configurationWatcher_, ProviderLog(log_)),
       analytics_(std::make_unique<SqliteKeeper>(launch.stateDirectory, clock_, ProviderLog(log_)),
                  configurationWatcher_, clock_, ledger_, ProviderLog(log_))
 {

@@ -15,9 +15,9 @@
 #include "platform/linux/diagnostics/FolderLimits.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "platform/linux/log/LinuxLog.h"
+#include "platform/linux/memory/LinuxMemory.h"
 #include "platform/linux/process/LinuxClock.h"
 #include "platform/linux/process/LinuxProcessTable.h"
-#include "platform/linux/queues/LinuxMemory.h"
 #include "platform/linux/queues/LinuxWorkQueues.h"
 #include "platform/linux/settings/ConfigurationWatcher.h"
 #include "platform/linux/settings/LinuxDeviceSettings.h"
@@ -70,7 +70,7 @@ private:
     LinuxBugCapture bugCapture_;
     TracefsKernelTrace kernelTrace_;
     LinuxPerformanceWriter performanceWriter_;
-    LinuxMemory memory_{workQueues_};
+    LinuxMemory memory_;
     AnalyticsStore analytics_;
     LinuxWorkQueues workQueues_; // destroyed first, because its turns end in the store
 };

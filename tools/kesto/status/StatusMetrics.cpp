@@ -74,6 +74,10 @@ void appendProcess(const Dictionary& report, std::string& text)
     appendGauge("kesto_connections", "Connections that are open now.", ledger::numberIn(report, "now.connections"),
                 text);
     appendGauge("kesto_sessions", "Sessions that exist now.", ledger::numberIn(report, "now.sessions"), text);
+    appendGauge("kesto_memory_used_bytes", "Memory that what clients sent takes.",
+                ledger::numberIn(report, "memory.used"), text);
+    appendGauge("kesto_memory_limit_bytes", "Memory that what clients send may take.",
+                ledger::numberIn(report, "memory.limit"), text);
     appendGauge("kesto_losses", "What was lost or refused since the service started.",
                 ledger::lossesIn(*report.find("sinceStart")->dictionary()), text);
 }

@@ -60,6 +60,8 @@ private:
         return ledger::countedText(numberIn(report_, path), one);
     }
 
+    [[nodiscard]] std::string size(std::string_view path) const { return sizeText(numberIn(report_, path)); }
+
     void addHead()
     {
         if (isRunning_) {
@@ -69,12 +71,16 @@ private:
             addLine(fmt::format("{} and {} now; {} and {} in the last minute", counted("now.connections", "connection"),
                                 counted("now.sessions", "session"), counted("rates.deliveries", "message"),
                                 counted("rates.events", "event")));
+            if (report_.contains("memory")) // an earlier version does not tell it
+                addLine(
+                    fmt::format("what clients sent takes {} of at most {} of memory; a user may have {}, a client {}",
+                                size("memory.used"), size("memory.limit"), size("memory.limitOfAUser"),
+                                size("memory.limitOfAClient")));
         } else {
             addLine("kestod does not run; this is what it counted before");
         }
         const std::uint64_t oldest = numberIn(report_, "store.oldest");
-        addLine(fmt::format("the store has {} in {}{}", counted("store.events", "event"),
-                            sizeText(numberIn(report_, "store.bytes")),
+        addLine(fmt::format("the store has {} in {}{}", counted("store.events", "event"), size("store.bytes"),
                             oldest == 0 ? "" : ", the oldest of " + moment(oldest)));
     }
 

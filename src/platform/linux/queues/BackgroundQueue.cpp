@@ -2,6 +2,7 @@
 #include "platform/linux/queues/BackgroundQueue.h"
 
 #include "platform/linux/process/Thread.h"
+#include "platform/linux/queues/ThreadHeap.h"
 
 #include <system_error>
 #include <utility>
@@ -66,12 +67,16 @@ std::size_t BackgroundQueue::unfinishedItems() const
     return unfinished_;
 }
 
+// A thread of this queue is never woken to tidy its heap: it does so after its next item, and the thread that asks all
+// heaps is usually one of these.
 void BackgroundQueue::run()
 {
     queueOfThisThread = this;
+    ThreadHeap heap([] { });
     while (WorkItem item = take()) {
         item();
         item = nullptr;
+        heap.tidyIfAsked();
         countFinished();
     }
 }

@@ -3,6 +3,7 @@
 #include "platform/linux/queues/DelayedWork.h"
 
 #include "platform/linux/process/Thread.h"
+#include "platform/linux/queues/ThreadHeap.h"
 
 #include <system_error>
 #include <utility>
@@ -42,10 +43,15 @@ bool DelayedWork::start()
     }
 }
 
+// A new thread may get memory that another has used, so this one tidies its heap, too. It needs no waking: an item that
+// is due soon after the request wakes it (LinuxMemory).
 void DelayedWork::run()
 {
-    while (Schedule::node_type due = waitForDue())
+    ThreadHeap heap([] { });
+    while (Schedule::node_type due = waitForDue()) {
+        heap.tidyIfAsked();
         due.mapped().queue.submit(std::move(due.mapped().item));
+    }
 }
 
 // Waits for the next item that is due; empty at the end.

@@ -1,9 +1,10 @@
-// Every key is read separately: a wrong value affects only its own setting, and a line says which value belongs there.
+// The values that each key may have.
 #include "platform/linux/store/AnalyticsConfiguration.h"
+
+#include "platform/linux/settings/CheckedSettings.h"
 
 #include <algorithm>
 #include <cmath>
-#include <fmt/format.h>
 #include <optional>
 #include <sqlite3.h>
 
@@ -24,13 +25,6 @@ std::optional<std::vector<std::string>> stringsOf(const Value& value)
     for (const Value& each : *array)
         strings.push_back(each.text());
     return strings;
-}
-
-std::optional<double> positiveNumberOf(const Value& value)
-{
-    const auto number = value.number();
-    const bool isNumber = number && number->kind() != foundation::Number::Kind::Boolean;
-    return isNumber && number->doubleValue() > 0 ? std::optional(number->doubleValue()) : std::nullopt;
 }
 
 // Stores the value, or returns what should stand there instead.
@@ -67,9 +61,8 @@ std::string_view read(std::string_view key, const Value& value, AnalyticsConfigu
 CheckedAnalyticsConfiguration readAnalyticsConfiguration(const foundation::Dictionary& values)
 {
     CheckedAnalyticsConfiguration checked;
-    for (const auto& [key, value] : values)
-        if (const auto expected = read(key, value, checked.configuration); !expected.empty())
-            checked.problems.push_back(fmt::format("{} = {} should be {}", key.view(), value.text(), expected));
+    checked.problems = checkSettings(
+        values, [&](std::string_view key, const Value& value) { return read(key, value, checked.configuration); });
     return checked;
 }
 

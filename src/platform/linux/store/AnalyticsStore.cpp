@@ -2,6 +2,7 @@
 #include "platform/linux/store/AnalyticsStore.h"
 
 #include "platform/linux/process/Thread.h"
+#include "platform/linux/settings/CheckedSettings.h"
 
 #include <future>
 #include <utility>
@@ -183,8 +184,7 @@ void AnalyticsStore::applyConfiguration()
         problems = std::move(checked.problems);
         wakeKeeper();
     }
-    for (const std::string& problem : problems)
-        log_.error("{}: {}; the default counts until this is corrected", configurationFile_.path().native(), problem);
+    logProblems(configurationFile_.path(), problems, log_);
 }
 
 bool AnalyticsStore::isEverythingKept() const

@@ -27,10 +27,9 @@ SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>>
 SqliteEventFile::open(const std::filesystem::path& path, const Clock& clock, KnownOrigins& origins)
 {
     std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path, clock, origins));
-    for (const auto step :
-         {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::makeSchema,
-          &SqliteEventFile::configure, &SqliteEventFile::prepareStatements, &SqliteEventFile::compareCounts,
-          &SqliteEventFile::beginRun})
+    for (const auto step : {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::makeSchema,
+                            &SqliteEventFile::configure, &SqliteEventFile::prepareStatements,
+                            &SqliteEventFile::compareCounts, &SqliteEventFile::beginRun})
         if (const auto done = (*database.*step)(); !done)
             return std::unexpected(done.error());
     return database;

@@ -18,7 +18,11 @@ using testing::HasSubstr;
 using testing::Not;
 using testing::StartsWith;
 
-constexpr ledger::ServiceProcess process{.version = "1.2.3", .isInternalBuild = true, .started = 1700000000};
+constexpr ledger::ServiceProcess process{
+    .version = "1.2.3", .isInternalBuild = true, .started = 1700000000, .memory = [] {
+        return ledger::MemoryState{
+            .used = 4'000, .limit = 64'000'000, .limitOfAUser = 48'000'000, .limitOfAClient = 32'100'000};
+    }};
 
 class StatusText : public testing::Test {
 protected:
@@ -51,6 +55,7 @@ TEST_F(StatusText, HasTheRunAndTheWhole)
     EXPECT_EQ(statusText(running(), std::string::npos),
               "kestod 1.2.3 (internal build), running since 2023-11-14 22:13:20\n"
               "0 connections and 0 sessions now; 1 message and 0 events in the last minute\n"
+              "what clients sent takes 4 kB of at most 64.0 MB of memory; a user may have 48.0 MB, a client 32.1 MB\n"
               "the store has 7 events in 35.2 MB, the oldest of 2022-04-15 05:20:00\n"
               "\n"
               "COUNTED                                  SINCE START  SINCE 2020-09-13\n"
@@ -88,6 +93,15 @@ TEST_F(StatusText, SaysThatTheServiceDoesNotRun)
     EXPECT_THAT(text, HasSubstr("  kept                                                       2,001,204\n"));
 }
 
+TEST_F(StatusText, SaysNothingOfMemoryForAServiceOfAnEarlierVersion)
+{
+    Dictionary::Entries entries;
+    for (const auto& [key, value] : running())
+        if (key.view() != "memory")
+            entries.push_back({key, value});
+    EXPECT_THAT(statusText(Dictionary(entries), std::string::npos), Not(HasSubstr("memory")));
+}
+
 TEST_F(StatusText, IsCutToItsWidth)
 {
     std::istringstream lines(statusText(running(true), 40));
@@ -123,6 +137,8 @@ TEST_F(StatusMetrics, HasTheProcessTheStoreAndAllCounters)
                           "kesto_removed_total{reason=\"size\"} 0\n"
                           "kesto_removed_total{reason=\"share\"} 0\n"
                           "kesto_removed_total{reason=\"damage\"} 0\n"));
+    EXPECT_THAT(text, HasSubstr("\nkesto_memory_used_bytes 4000\n"));
+    EXPECT_THAT(text, HasSubstr("\nkesto_memory_limit_bytes 64000000\n"));
     EXPECT_THAT(text, HasSubstr("\nkesto_kept_total 2001204\n"));
     EXPECT_THAT(text, HasSubstr("\nkesto_calls_total{operation=\"sendMessage\"} 0\n"));
     EXPECT_THAT(text, HasSubstr("\nkesto_connections_refused_total{reason=\"userLimit\"} 0\n"));

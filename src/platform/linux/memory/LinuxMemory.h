@@ -1,0 +1,54 @@
+// The room of memory: how much of it what clients send may take, and how freed memory returns to the system. It reads
+// limits.toml and asks the threads' heaps to tidy up. It does not know what the memory is used for.
+//
+// An allocator keeps freed memory for the next request, and returns it to the system only in the course of later
+// requests: a service that falls idle after a long session would keep that session's memory for ever. It returns after
+// some seconds, not immediately, for two reasons: the next session would pay again for the first touch of every page,
+// and the threads that write what a session left still use it.
+#pragma once
+
+#include "platform/Memory.h"
+#include "platform/WorkQueue.h"
+#include "platform/linux/settings/WatchedTomlFile.h"
+
+#include <atomic>
+#include <chrono>
+
+namespace platform {
+
+// Any thread. It outlives the work that the queues delay.
+class LinuxMemory final : public Memory {
+public:
+    // Fewer bytes are not worth waking threads for.
+    static constexpr std::size_t much = std::size_t{4} << 20;
+    // From the moment when `much` bytes are free until the heaps are tidied, and until all threads have done that.
+    static constexpr std::chrono::seconds delay{5};
+    static constexpr std::chrono::seconds timeToTidy{1};
+
+    // The bytes of memory that this process has from the system.
+    static std::size_t residentBytes();
+
+    // limits.toml in the configuration directory has the limits; the log reports wrong values in it.
+    LinuxMemory(WorkQueues& queues, ConfigurationWatcher& watcher, ProviderLog log,
+                std::size_t (*resident)() = residentBytes);
+
+    void letGo(std::size_t bytes) override;
+    void clientGone() override;
+    [[nodiscard]] MemoryLimits limits() const override;
+
+private:
+    void applyLimits();
+    void tidy();
+
+    WorkQueues& queues_;
+    const ProviderLog log_;
+    std::size_t (*const resident_)();
+    std::atomic<std::size_t> bytes_ = 0; // since the heaps were last tidied
+    std::atomic<std::size_t> residentWhenTidy_; // when they were last tidied, or at the start
+    std::atomic<std::size_t> mostOfTheService_ = 0;
+    std::atomic<std::size_t> mostOfAUser_ = 0;
+    std::atomic<std::size_t> mostOfAClient_ = 0;
+    WatchedTomlFile limitsFile_; // destroyed first
+};
+
+} // namespace platform

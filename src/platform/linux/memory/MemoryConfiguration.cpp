@@ -1,0 +1,68 @@
+// A client is one of its user's, so it never gets a larger part than its user.
+#include "platform/linux/memory/MemoryConfiguration.h"
+
+#include "platform/linux/settings/CheckedSettings.h"
+
+#include <algorithm>
+
+namespace platform {
+
+using foundation::Value;
+
+namespace {
+
+constexpr double mostMegabytes = 1024.0 * 1024;
+constexpr double bytesOfAMegabyte = 1024.0 * 1024;
+
+struct Settings {
+    double bytes;
+    double partOfAUser = DefaultMemory::partOfAUser;
+    double partOfAClient = DefaultMemory::partOfAClient;
+};
+
+bool readPart(const Value& value, double& part)
+{
+    const auto number = positiveNumberOf(value);
+    if (!number || *number > 1)
+        return false;
+    part = *number;
+    return true;
+}
+
+// Stores the value, or returns what should stand there instead.
+std::string_view read(std::string_view key, const Value& value, Settings& settings)
+{
+    constexpr std::string_view part = "a part above 0, up to 1";
+    if (key == "memory_mb") {
+        const auto megabytes = positiveNumberOf(value);
+        if (!megabytes || *megabytes < 1 || *megabytes > mostMegabytes)
+            return "a number of megabytes from 1 to 1048576";
+        settings.bytes = *megabytes * bytesOfAMegabyte;
+    } else if (key == "memory_part_of_user") {
+        return readPart(value, settings.partOfAUser) ? std::string_view() : part;
+    } else if (key == "memory_part_of_client") {
+        return readPart(value, settings.partOfAClient) ? std::string_view() : part;
+    } else {
+        return "nothing: the keys are memory_mb, memory_part_of_user and memory_part_of_client";
+    }
+    return {};
+}
+
+} // namespace
+
+CheckedMemoryLimits readMemoryLimits(const foundation::Dictionary& values, std::size_t bytesOfTheMachine)
+{
+    Settings settings{.bytes = static_cast<double>(std::clamp(bytesOfTheMachine / DefaultMemory::partOfTheMachine,
+                                                              DefaultMemory::least, DefaultMemory::most))};
+    CheckedMemoryLimits checked;
+    checked.problems =
+        checkSettings(values, [&](std::string_view key, const Value& value) { return read(key, value, settings); });
+    const double ofAUser = settings.bytes * settings.partOfAUser;
+    checked.limits = {.ofTheService = static_cast<std::size_t>(settings.bytes),
+                      .ofAUser = static_cast<std::size_t>(ofAUser),
+                      .ofAClient =
+                          static_cast<std::size_t>(std::min(settings.bytes * settings.partOfAClient, ofAUser))};
+    return checked;
+}
+
+} // namespace platform
