@@ -18,11 +18,12 @@ using namespace std::chrono_literals;
 
 constexpr std::size_t megabyte = std::size_t{1} << 20;
 
-std::size_t megabytesOfTheProcess = 0;
+constexpr std::size_t megabytesAtFirst = 20; // `memory` notes them when it is made
+std::size_t megabytesOfTheProcess = megabytesAtFirst;
 
 class LinuxMemoryTest : public testing::Test {
 protected:
-    LinuxMemoryTest() { megabytesOfTheProcess = 20; }
+    ~LinuxMemoryTest() override { megabytesOfTheProcess = megabytesAtFirst; }
 
     // Waits until the condition holds; false if the time is over.
     template <typename Condition> [[nodiscard]] static bool becomesTrue(Condition condition)
