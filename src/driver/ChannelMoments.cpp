@@ -4,6 +4,7 @@
 
 #include "platform/Platform.h"
 #include "platform/WorkQueue.h"
+#include "utility/KestoReportingUtility.h"
 
 #include <system_error>
 #include <utility>
@@ -15,7 +16,10 @@ ChannelMoments::ChannelMoments(Read read) : shared_(std::make_shared<Shared>())
     shared_->read = std::move(read);
     try {
         queue_ = platform::current().workQueues.makeSerialQueue("com.quarn.kesto.reporting.channels", {});
-    } catch (const std::system_error&) { // a session that starts late is better than a service that does not start
+    } catch (const std::system_error& refusal) { // calls that come late are better than a service that does not start
+        KESTO_LOG(KestoReportingDriverUtilityCategory(), Error,
+                  "no thread reads the channels of drivers ({}): all calls wait while a session starts or stops",
+                  refusal.code().message());
     }
 }
 
