@@ -130,6 +130,10 @@ TEST_F(DriverUtility, ReadsOnTheCallersThreadIfTheSystemHasNoOther)
     session::DriverMoment moment;
     utility.readMoment([&](session::DriverMoment read) { moment = std::move(read); });
     EXPECT_THAT(utility.getSnapShot(moment), SizeIs(8));
+    EXPECT_THAT(platform.log.lines(),
+                testing::Contains(IsLine(Error, "kerd",
+                                         "no thread reads the channels of drivers (Resource temporarily unavailable): "
+                                         "all calls wait while a session starts or stops")));
 }
 
 TEST_F(DriverUtility, SubscribesToEveryDriverThatPublishes)

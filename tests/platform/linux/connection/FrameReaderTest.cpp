@@ -9,7 +9,7 @@
 namespace platform {
 namespace {
 
-std::string framed(std::string_view frame)
+std::string asFrame(std::string_view frame)
 {
     std::string bytes;
     appendFrame(frame, bytes);
@@ -35,8 +35,8 @@ bool read(FrameReader& reader, std::string_view bytes, std::vector<std::string>&
 
 TEST(FrameReader, WritesTheLengthAsFourLittleEndianBytes)
 {
-    EXPECT_EQ(framed(std::string(0x010203, 'x')).substr(0, frameHeadSize), std::string("\x03\x02\x01\x00", 4));
-    EXPECT_EQ(framed("abc"),
+    EXPECT_EQ(asFrame(std::string(0x010203, 'x')).substr(0, frameHeadSize), std::string("\x03\x02\x01\x00", 4));
+    EXPECT_EQ(asFrame("abc"),
               std::string("\x03\x00\x00\x00"
                           "abc",
                           7));
@@ -44,7 +44,7 @@ TEST(FrameReader, WritesTheLengthAsFourLittleEndianBytes)
 
 TEST(FrameReader, HandsOutWholeFramesWhereTheyLie)
 {
-    const std::string bytes = framed("first") + framed("second");
+    const std::string bytes = asFrame("first") + asFrame("second");
     FrameReader reader;
     reader.feed(bytes);
     const auto first = reader.next();
@@ -60,7 +60,7 @@ TEST(FrameReader, TakesAnEmptyFrame)
 {
     FrameReader reader;
     std::vector<std::string> frames;
-    EXPECT_TRUE(read(reader, framed("") + framed("x") + framed(""), frames));
+    EXPECT_TRUE(read(reader, asFrame("") + asFrame("x") + asFrame(""), frames));
     EXPECT_EQ(frames, (std::vector<std::string>{"", "x", ""}));
 }
 
@@ -68,7 +68,7 @@ TEST(FrameReader, PutsAFrameTogetherFromSingleBytes)
 {
     FrameReader reader;
     std::vector<std::string> frames;
-    for (const char byte : framed("hello") + framed("world"))
+    for (const char byte : asFrame("hello") + asFrame("world"))
         EXPECT_TRUE(read(reader, std::string_view(&byte, 1), frames));
     EXPECT_EQ(frames, (std::vector<std::string>{"hello", "world"}));
 }
@@ -78,7 +78,7 @@ TEST(FrameReader, KnowsWhetherItStandsInsideAFrame)
     FrameReader reader;
     std::vector<std::string> frames;
     EXPECT_FALSE(reader.isInsideFrame());
-    for (const char byte : framed("ab").substr(0, frameHeadSize + 1)) {
+    for (const char byte : asFrame("ab").substr(0, frameHeadSize + 1)) {
         EXPECT_TRUE(read(reader, std::string_view(&byte, 1), frames));
         EXPECT_TRUE(reader.isInsideFrame());
     }
@@ -104,7 +104,7 @@ TEST(FrameReader, GivesTheFramesBeforeOneThatIsTooLong)
 {
     FrameReader reader;
     std::vector<std::string> frames;
-    EXPECT_FALSE(read(reader, framed("good") + headOfTooLong + "more", frames));
+    EXPECT_FALSE(read(reader, asFrame("good") + headOfTooLong + "more", frames));
     EXPECT_EQ(frames, std::vector<std::string>{"good"});
 }
 
@@ -122,7 +122,7 @@ TEST(FrameReader, GivesTheRoomForALargeFrameBack)
 {
     FrameReader reader;
     std::vector<std::string> frames;
-    const std::string bytes = framed(std::string(longestFrame, 'x'));
+    const std::string bytes = asFrame(std::string(longestFrame, 'x'));
     EXPECT_TRUE(read(reader, std::string_view(bytes).substr(0, 1000), frames));
     EXPECT_TRUE(read(reader, std::string_view(bytes).substr(1000), frames));
     ASSERT_EQ(frames.size(), 1U);
@@ -134,7 +134,7 @@ TEST(FrameReader, PutsALargeFrameTogetherFromSingleBytesInReasonableTime)
 {
     FrameReader reader;
     std::vector<std::string> frames;
-    const std::string bytes = framed(std::string(longestFrame, 'x'));
+    const std::string bytes = asFrame(std::string(longestFrame, 'x'));
     for (const char byte : bytes)
         ASSERT_TRUE(read(reader, std::string_view(&byte, 1), frames));
     ASSERT_EQ(frames.size(), 1U);
