@@ -28,7 +28,7 @@ enum WireMethod : std::uint8_t {
     KillService
 };
 
-inline const foundation::Value null;
+inline const foundation::Value null{};
 
 // One thread.
 class WireClient {
