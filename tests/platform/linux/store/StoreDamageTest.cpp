@@ -83,7 +83,7 @@ protected:
     }
     template <typename Condition> static void waitFor(Condition condition)
     {
-        const auto deadline = std::chrono::steady_clock::now() + 20s;
+        const auto deadline = std::chrono::steady_clock::now() + 60s; // a check has the lowest priority
         while (!condition() && std::chrono::steady_clock::now() < deadline)
             std::this_thread::sleep_for(1ms);
         EXPECT_TRUE(condition());
