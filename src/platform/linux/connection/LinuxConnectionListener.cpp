@@ -128,10 +128,11 @@ int LinuxConnectionListener::waitingTime() const
 
 void LinuxConnectionListener::handle(const epoll_event& event)
 {
-    if (event.data.ptr == &socket_) {
+    const void* const tag = event.data.ptr; // a copy, because the kernel packs its structure
+    if (tag == &socket_) {
         acceptWaiting();
-    } else if (event.data.ptr != &wake_) { // `wake_` itself needs no handling
-        const auto& reader = connections_.at(event.data.ptr);
+    } else if (tag != &wake_) { // `wake_` itself needs no handling
+        const auto& reader = connections_.at(tag);
         reader->events |= event.events;
         ready_.enter(reader);
     }
