@@ -2,6 +2,8 @@
 // the runtime directory of a service is.
 #include "neighbours/ChannelCrowd.h"
 
+#include "neighbours/FloodProcesses.h"
+
 #include <array>
 #include <fmt/format.h>
 #include <fstream>
@@ -36,9 +38,8 @@ fs::path folderOf(const fs::path& tree, int number)
 // Of another user than the channels', where this process may give it away.
 void makeFolderOfAnother(const fs::path& folder)
 {
-    constexpr uid_t nobody = 65534;
     fs::create_directory(folder);
-    static_cast<void>(::lchown(folder.c_str(), nobody, nobody) == 0);
+    [[maybe_unused]] const int refused = ::lchown(folder.c_str(), otherUser, otherUser);
 }
 
 fs::path placeInMemory()

@@ -40,7 +40,6 @@ void raiseDescriptorLimit()
 
 void becomeOtherUser()
 {
-    constexpr id_t otherUser = 65'534;
     if (::setgroups(0, nullptr) != 0 || ::setgid(otherUser) != 0 || ::setuid(otherUser) != 0)
         throw std::system_error(errno, std::generic_category(), "becoming another user");
     ::prctl(PR_SET_PDEATHSIG, SIGKILL); // the kernel forgets it with the user

@@ -10,6 +10,8 @@
 
 namespace bench {
 
+constexpr std::uint32_t otherUser = 65'534; // the user without rights of most systems
+
 class FloodProcesses {
 public:
     enum class User : std::uint8_t { Same, Other }; // the other one only if this process runs as root

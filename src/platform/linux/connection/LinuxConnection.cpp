@@ -103,15 +103,18 @@ LinuxConnection::Next LinuxConnection::handle(std::uint32_t events, std::size_t 
 {
     assert(hub_->isConnectionThread());
     constexpr std::uint32_t endings = EPOLLHUP | EPOLLRDHUP | EPOLLERR;
-    if ((events & EPOLLOUT) != 0) {
-        const foundation::Lock lock(lock_);
-        writeOutput();
-    }
     if ((events & ~EPOLLOUT) != 0)
         mayHaveUnread_ = true;
     if ((events & endings) != 0)
         peerIsGone_ = true;
-    if (mayHaveUnread_ && mayRead())
+    bool reads = false;
+    {
+        const foundation::Lock lock(lock_);
+        if ((events & EPOLLOUT) != 0)
+            writeOutput();
+        reads = wantsToRead();
+    }
+    if (reads)
         read(mostBytes);
     answerStatusRequest();
     return settle();
@@ -119,10 +122,9 @@ LinuxConnection::Next LinuxConnection::handle(std::uint32_t events, std::size_t 
 
 // It also reads from a client that is behind but gone: the bytes left in the socket are limited, and only behind them
 // does the connection find its end.
-bool LinuxConnection::mayRead()
+bool LinuxConnection::wantsToRead() const
 {
-    const foundation::Lock lock(lock_);
-    return !breakReason_ && (peerIsGone_ || (watchedEvents_ & EPOLLIN) != 0);
+    return mayHaveUnread_ && !breakReason_ && (peerIsGone_ || (watchedEvents_ & EPOLLIN) != 0);
 }
 
 // Ends the connection if it broke or the peer closed it; otherwise watches for what comes next. Call it after
@@ -136,9 +138,8 @@ LinuxConnection::Next LinuxConnection::settle()
             return Next::End;
         if (!breakReason_ && !peerIsDone_) {
             watch();
-            const bool reads = mayHaveUnread_ && (peerIsGone_ || (watchedEvents_ & EPOLLIN) != 0);
             const bool answers = !statusRequests_.empty() && output_.empty();
-            return reads || answers ? Next::Turn : Next::Event;
+            return wantsToRead() || answers ? Next::Turn : Next::Event;
         }
         reason = breakReason_; // it counts even if the peer closed at the same moment
     }

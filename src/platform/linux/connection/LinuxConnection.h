@@ -89,7 +89,7 @@ private:
         std::size_t size; // of its frame
     };
 
-    [[nodiscard]] bool mayRead();
+    [[nodiscard]] bool wantsToRead() const KESTO_REQUIRES(lock_);
     [[nodiscard]] Next settle();
     void read(std::size_t mostBytes);
     void endOfStream();

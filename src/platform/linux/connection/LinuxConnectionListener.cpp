@@ -87,7 +87,7 @@ void LinuxConnectionListener::resume()
         reader->connection->finish();
 }
 
-// When this thread has read everything, it helps with the calls of the clients, if they are few.
+// After each slice of reading this thread helps with the calls of the clients, if they are few.
 void LinuxConnectionListener::serve()
 {
     SerialQueue::Helper helper;

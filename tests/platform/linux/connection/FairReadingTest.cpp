@@ -1,12 +1,10 @@
 // A client that sends little is read beside those that send much, and what cuts a read short loses nothing.
 #include "platform/linux/connection/ConnectionHarness.h"
+#include "platform/linux/connection/ConnectionOutput.h"
 
 #include <algorithm>
-#include <array>
-#include <cstring>
 #include <latch>
 #include <string>
-#include <sys/socket.h>
 #include <vector>
 
 namespace platform {
@@ -37,7 +35,7 @@ protected:
     std::vector<const ConnectionRecord*> order; // of calls: whose they were
 };
 
-TEST_F(FairReading, WhoSendsLittleIsReadBeforeTheRestOfWhoSendsMuch)
+TEST_F(FairReading, AClientThatSendsLittleIsReadBeforeTheRestOfOneThatSendsMuch)
 {
     std::latch everythingIsSent(1);
     handleTheFirstCallUntil(everythingIsSent);
@@ -59,7 +57,7 @@ TEST_F(FairReading, WhoSendsLittleIsReadBeforeTheRestOfWhoSendsMuch)
     EXPECT_EQ(order[1], &modestRecord);
 }
 
-TEST_F(FairReading, ManyWhoSendMuchAreReadALittleAtATime)
+TEST_F(FairReading, ClientsThatSendMuchAreReadALittleAtATime)
 {
     std::latch everythingIsSent(1);
     handleTheFirstCallUntil(everythingIsSent);
@@ -93,21 +91,9 @@ TEST_F(FairReading, CallsBehindADescriptorAreDeliveredAtTheEndOfItsClient)
     listen();
     SocketClient client(path);
     ConnectionRecord& record = connected();
-    const std::string bytes = callNumber(1);
-    iovec data{const_cast<char*>(bytes.data()), bytes.size()};
-    alignas(cmsghdr) std::array<char, CMSG_SPACE(sizeof(int))> control{};
-    msghdr message{};
-    message.msg_iov = &data;
-    message.msg_iovlen = 1;
-    message.msg_control = control.data();
-    message.msg_controllen = control.size();
-    cmsghdr* const head = CMSG_FIRSTHDR(&message);
-    head->cmsg_level = SOL_SOCKET;
-    head->cmsg_type = SCM_RIGHTS;
-    head->cmsg_len = CMSG_LEN(sizeof(int));
-    const int descriptor = client.descriptor();
-    std::memcpy(CMSG_DATA(head), &descriptor, sizeof descriptor);
-    ASSERT_EQ(::sendmsg(client.descriptor(), &message, MSG_NOSIGNAL), static_cast<ssize_t>(bytes.size()));
+    ConnectionOutput output;
+    output.append(callNumber(1), {client.descriptor(), client.descriptor()});
+    ASSERT_EQ(output.writeTo(client.descriptor()), callNumber(1).size());
     client.write(callNumber(2));
     client.stopWriting();
     EXPECT_TRUE(waitForHistory(record, {"call 1", "call 2", "invalidated"}));
