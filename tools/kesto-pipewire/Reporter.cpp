@@ -104,6 +104,10 @@ void Reporter::runningChanged(StreamSerial serial, bool running, Moment when)
     update(serial, when, [&](Stream& stream) {
         if (!running && stream.running.current && !stream.running.reported)
             reportChanges(stream, infinity); // even the shortest run is reported
+        // A stream stops a moment after its device has gone. Its Stop still names that device, so the device counts as
+        // gone since then, also if the stream runs again at once: later changes may have been reported by that time.
+        if (!running && stream.running.current && stream.devices.current.empty())
+            stream.devices.changedAt = when;
         stream.running.observe(running, when);
     });
 }
@@ -169,13 +173,10 @@ Reporter::Changes Reporter::changesOf(const Stream& stream)
     if (stream.runs == 0)
         return changes; // the first Start reports the others
 
-    // A stream stops a moment after its device has gone; its Stop still names that device.
-    const auto stopsForIt = devices.current.empty() && running.isPending() && !running.current;
-    const auto moved = stopsForIt ? later(devices.changedAt, running.changedAt) : devices.changedAt;
     add(volume, &Reporter::reportVolume, volume.changedAt,
         std::max(volume.changedAt.uptime, volume.reportedSince.uptime + volumeInterval));
     add(format, &Reporter::reportFormat, format.changedAt, format.changedAt.uptime + settlingTime);
-    add(devices, &Reporter::reportDevices, moved, moved.uptime + settlingTime);
+    add(devices, &Reporter::reportDevices, devices.changedAt, devices.changedAt.uptime + settlingTime);
     return changes;
 }
 
