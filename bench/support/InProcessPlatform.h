@@ -49,6 +49,7 @@ private:
             return platform::LogLevel::Default;
         }
         void write(const platform::LogRecord&) override { }
+        void flush() override { }
     };
     class Clock final : public platform::Clock {
         [[nodiscard]] double secondsSince1970() const override { return 1'767'225'600; }

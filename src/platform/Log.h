@@ -81,6 +81,8 @@ public:
     [[nodiscard]] virtual LogLevel threshold(const LogCategory& category) const = 0;
     // Writes the line in any case: callers check the threshold first.
     virtual void write(const LogRecord& record) = 0;
+    // For the end of the process: returns when all lines so far are where the log goes, or after a second.
+    virtual void flush() = 0;
 };
 
 // The prefix that every line starts with: the name right-aligned in 25 columns, the line left-aligned in 5.

@@ -20,6 +20,7 @@ void reportLosses()
             losses += foundation::format("{}{} {}", losses.empty() ? "" : ", ", row.path, account[row.counter]);
     if (!losses.empty())
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Error, "lost since the start: {}", losses);
+    platform::current().log.flush();
 }
 
 void endProcess(int status)

@@ -47,6 +47,7 @@ TEST_P(BadInputTest, EndsThatConnectionWithOneLineAndNoOther)
     GetParam().send(bad);
     EXPECT_TRUE(bad.isClosed());
     ASSERT_TRUE(kestod.waitForLog(GetParam().reason)) << GetParam().reason;
+    kestod.awaitLog();
     EXPECT_EQ(kestod.countInLog(GetParam().reason), 1U);
 
     EXPECT_EQ(good.ask(SendMessage, Dictionary{{"after", 1}}, 4, 2, Array{1}),

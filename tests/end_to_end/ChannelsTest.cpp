@@ -87,6 +87,7 @@ TEST_F(ChannelsTest, AHostileTreeCostsItsFilesAndNothingElse)
     kestod.start();
     runSession([&] { late.add(7); });
     EXPECT_THAT(kestod.events("com.quarn.kesto.Cavlet.Simple"), SizeIs(1));
+    kestod.awaitLog();
     for (const char* name : {"folder", "half", "link", "pipe"})
         EXPECT_EQ(kestod.countInLog("channel hostile/Tx/-/" + std::string(name) + " is left out"), 1U) << name;
 }
@@ -138,6 +139,7 @@ TEST_F(KilledDriverTest, WhatItLeftIsNotReported)
     for (const std::size_t afterwards : {1U, 2U})
         EXPECT_THAT(states[afterwards].payload,
                     AllOf(Not(HasSubstr("dock_Speaker_old")), HasSubstr("dock_Speaker_new_State_state")));
+    kestod.awaitLog();
     EXPECT_EQ(kestod.countInLog("is left out"), 0U);
 }
 

@@ -4,12 +4,15 @@
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
 #include "platform/linux/damage/DatabaseDamage.h"
+#include "platform/linux/files/FileDescriptor.h"
 #include "support/MessageKinds.h"
 
 #include <algorithm>
+#include <array>
 #include <atomic>
 #include <cmath>
 #include <csignal>
+#include <fcntl.h>
 #include <gmock/gmock.h>
 #include <random>
 #include <stdexcept>
@@ -534,6 +537,26 @@ TEST_P(EndUnderLoadTest, WhatWasAnsweredIsCountedAndKept)
 
 INSTANTIATE_TEST_SUITE_P(Ends, EndUnderLoadTest, testing::Values(End::BySigkill, End::ByKillService, End::BySigterm),
                          [](const auto& test) { return nameOf(test.param); });
+
+TEST(BlockedLogTest, CallsAreAnsweredAndLinesThatAreLostAreCounted)
+{
+    std::array<int, 2> ends{};
+    ASSERT_EQ(::pipe2(ends.data(), O_CLOEXEC), 0);
+    const platform::FileDescriptor reader(ends[0]); // reads nothing
+    const platform::FileDescriptor writer(ends[1]);
+    Kestod kestod({}, {{"KESTO_LOG", "default"}});
+    kestod.start({.standardError = writer.get()});
+    WireClient client(kestod.socketPath());
+    client.ask(Create, 1);
+    constexpr int calls = 12'000; // each with a line: more than may wait
+    for (int call = 0; call < calls; ++call)
+        client.call(Validate, 1);
+    for (int call = 0; call < calls; ++call)
+        ASSERT_TRUE(client.nextReply());
+    EXPECT_GT(readLedger(kestod)[Counter::LogLinesLost], 0U);
+    client.call(KillService);
+    EXPECT_EQ(kestod.exitStatus(), 2) << "the end does not wait for ever";
+}
 
 TEST_F(FaultsTest, ConnectionsThatComeAndGoAreCounted)
 {

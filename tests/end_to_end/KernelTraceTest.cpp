@@ -161,6 +161,7 @@ protected:
     {
         if (tracefs.problem())
             return *tracefs.problem();
+        kestod.awaitLog();
         const std::string log = kestod.log();
         const std::size_t place = log.find("the kernel trace is not available: ");
         return place == std::string::npos ? "" : log.substr(place, log.find('\n', place) - place);
@@ -222,6 +223,7 @@ TEST_F(KernelTraceTest, MeasuresWhatAClientEmitsFromSeveralThreads)
     std::vector<double> values = results("shared");
     std::ranges::sort(values);
     expectWithin(values, shared);
+    kestod.awaitLog();
     EXPECT_EQ(kestod.countInLog("DISCARDED"), 0U);
 }
 
@@ -292,6 +294,7 @@ TEST_F(KernelTraceTest, MeasuresAgainWhenTheServiceWasKilledDuringATrace)
     const Bounds bounds = emitInterval(tracer, sharedBegin, sharedEnd, std::chrono::microseconds(500));
     stopSession();
     expectWithin(results("shared"), {bounds});
+    kestod.awaitLog();
     EXPECT_EQ(kestod.countInLog("the kernel trace is not available"), 0U) << "it is taken over";
 }
 

@@ -151,6 +151,16 @@ std::size_t Kestod::countInLog(std::string_view text) const
     return count;
 }
 
+// Lines keep their order.
+void Kestod::awaitLog() const
+{
+    constexpr std::string_view arrival = "new client with pid";
+    const std::size_t before = countInLog(arrival);
+    WireClient(socketPath()).ask(GetAllReporters);
+    if (!waitUntil([&] { return countInLog(arrival) > before; }))
+        throw std::runtime_error("the service logs no new client");
+}
+
 std::expected<std::vector<StoreRow>, std::string> Kestod::readEvents(std::string_view pattern) const
 {
     const fs::path path = directory() / "state" / "analytics.sqlite3";

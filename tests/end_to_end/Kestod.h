@@ -81,10 +81,12 @@ public:
     [[nodiscard]] const std::filesystem::path& directory() const { return directory_.path(); }
     [[nodiscard]] std::filesystem::path socketPath() const { return directory() / "run" / "kesto.socket"; }
     // The process's standard error so far.
-    [[nodiscard]] std::string log() const;
+    [[nodiscard]] std::string log() const; // a line comes a few milliseconds after what it reports
     // Waits until the log holds the text; false if the time is over.
     [[nodiscard]] bool waitForLog(std::string_view text) const;
     [[nodiscard]] std::size_t countInLog(std::string_view text) const;
+    // Returns when the log holds the lines of all that was answered so far. Causes a line of a new client.
+    void awaitLog() const;
 
     // The stored events of names that match the pattern (GLOB), in order. Throws if the store cannot be read.
     [[nodiscard]] std::vector<StoreRow> events(std::string_view pattern = "*") const;

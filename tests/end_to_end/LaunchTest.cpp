@@ -139,7 +139,7 @@ TEST(LaunchTest, AFileThatIsNotADatabaseIsPutAsideAndAnotherBegun)
     kestod.start();
     WireClient(kestod.socketPath()).ask(SendMessage, foundation::Dictionary{{"a", 1}}, 4, 1, foundation::Value());
     EXPECT_EQ(kestod.events("com.quarn.kesto.Playback.Start").size(), 1U);
-    EXPECT_THAT(kestod.log(), HasSubstr("analytics.sqlite3.corrupt-"));
+    EXPECT_TRUE(kestod.waitForLog("analytics.sqlite3.corrupt-"));
 }
 
 TEST(LaunchTest, RemovesTheResultsThatAKilledServiceHadBegunToWrite)

@@ -40,6 +40,7 @@ public:
 
     [[nodiscard]] platform::LogLevel threshold(const platform::LogCategory&) const override { return threshold_; }
     void write(const platform::LogRecord& record) override;
+    void flush() override { } // a line is kept at once
 
 private:
     platform::LogLevel threshold_ = platform::LogLevel::Debug;

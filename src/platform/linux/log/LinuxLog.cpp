@@ -109,49 +109,57 @@ void LinuxLog::write(const LogRecord& record)
     appendLine(record, line);
     const std::string_view text(line.data(), line.size());
     recentLines_.add(LinuxClock().secondsSince1970(), record.level, record.category.tag(), text);
-    switch (journal_ ? sendToJournal(record, text) : Sent::NoJournal) {
-    case Sent::Yes: reportLost(); break;
-    case Sent::Lost:
-        ++lostLines_;
-        if (ledger::Ledger* ledger = ledger_)
-            ledger->count(ledger::Counter::LogLinesLost);
-        break;
-    case Sent::NoJournal:
-        line.push_back('\n');
-        writeToDescriptor({line.data(), line.size()});
-        break;
-    }
-}
-
-LinuxLog::Sent LinuxLog::sendToJournal(const LogRecord& record, std::string_view line)
-{
-    Buffer datagram;
-    fmt::format_to(std::back_inserter(datagram),
-                   "MESSAGE={}\nSUBSYSTEM={}\nCATEGORY={}\nPRIORITY={}\nCODE_FILE={}\nCODE_LINE={}\n"
-                   "SYSLOG_IDENTIFIER={}\n",
-                   line, record.category.subsystem(), record.category.tag(), journalPriority(record.level),
-                   record.location.file, record.location.line, program_invocation_short_name);
-    const int wait = journalIsBehind_ ? MSG_DONTWAIT : 0;
-    ssize_t sent = 0;
-    do {
-        sent = ::sendto(journal_.get(), datagram.data(), datagram.size(), MSG_NOSIGNAL | wait,
-                        reinterpret_cast<const sockaddr*>(&journalAddress_), sizeof journalAddress_);
-    } while (sent < 0 && errno == EINTR);
-    journalIsBehind_ = sent < 0 && (errno == EAGAIN || errno == ENOBUFS);
-    if (sent >= 0)
-        return Sent::Yes;
-    return journalIsBehind_ ? Sent::Lost : Sent::NoJournal;
+    if (writer_.add(record, text))
+        return;
+    ++lostLines_;
+    if (ledger::Ledger* ledger = ledger_)
+        ledger->count(ledger::Counter::LogLinesLost);
 }
 
 void LinuxLog::reportLost()
 {
     if (const std::uint64_t lost = lostLines_.exchange(0); lost > 0)
-        ProviderLog(*this).error("{} log lines were lost because the journal did not keep up", lost);
+        ProviderLog(*this).error("{} log lines were lost because the log did not keep up", lost);
 }
 
-void LinuxLog::writeToDescriptor(std::string_view line) const
+void LinuxLog::writeOut(const LogLines& lines)
 {
-    static_cast<void>(writeAll(descriptor_, line)); // a failure here cannot be reported anywhere
+    reportLost(); // with the next lines, for which there is room now
+    if (!journal_)
+        return writeToDescriptor(lines.text());
+    lines.forEach([this](const LogLines::Line& line, std::string_view text) {
+        if (!sendToJournal(line, text))
+            writeToDescriptor(std::string(text) + '\n');
+    });
+}
+
+// False without a journal. Waits for a slow one as long as the service runs; at its end only once, for all lines.
+bool LinuxLog::sendToJournal(const LogLines::Line& line, std::string_view text)
+{
+    Buffer datagram;
+    fmt::format_to(std::back_inserter(datagram),
+                   "MESSAGE={}\nSUBSYSTEM={}\nCATEGORY={}\nPRIORITY={}\nCODE_FILE={}\nCODE_LINE={}\n"
+                   "SYSLOG_IDENTIFIER={}\n",
+                   text, line.category->subsystem(), line.category->tag(), journalPriority(line.level),
+                   line.location.file, line.location.line, program_invocation_short_name);
+    const int flags = MSG_NOSIGNAL | (journalIsBehind_ ? MSG_DONTWAIT : 0);
+    while (::sendto(journal_.get(), datagram.data(), datagram.size(), flags,
+                    reinterpret_cast<const sockaddr*>(&journalAddress_), sizeof journalAddress_)
+           < 0) {
+        if (errno == EINTR)
+            continue;
+        if (errno != EAGAIN)
+            return false;
+        journalIsBehind_ = writer_.isEnding();
+        if (journalIsBehind_)
+            return true;
+    }
+    return true;
+}
+
+void LinuxLog::writeToDescriptor(std::string_view lines) const
+{
+    static_cast<void>(writeAll(descriptor_, lines)); // a failure here cannot be reported anywhere
 }
 
 } // namespace platform

@@ -3,16 +3,17 @@
 //
 // The log: journald where the service runs under it, standard error elsewhere.
 //
-// The journal gets one datagram for each line in its native protocol, with the category and the place of the statement
-// as fields that can be searched; a descriptor gets one write for each line. Messages hold text from clients, so line
-// ends and other control characters are written as escapes: a message cannot look like two lines, end a field of the
-// protocol, or control a reader's terminal.
+// A thread of its own writes the lines. The journal gets one datagram for each line in its native protocol, with the
+// category and the place of the statement as fields that can be searched; a descriptor gets whole lines. Messages hold
+// text from clients, so line ends and other control characters are written as escapes: a message cannot look like two
+// lines, end a field of the protocol, or control a reader's terminal.
 #pragma once
 
 #include "ledger/Ledger.h"
 #include "platform/Log.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/log/LogThresholds.h"
+#include "platform/linux/log/LogWriter.h"
 #include "platform/linux/log/RecentLogLines.h"
 
 #include <atomic>
@@ -42,10 +43,11 @@ public:
         return thresholds_.threshold(category.tag());
     }
 
-    // Waits a short time for a slow journal, and does not wait again before the journal has taken a line. Lines that it
-    // does not take are lost; after the next line that it takes, a line reports their number. If the journal does not
-    // exist, lines go to the descriptor.
+    // Never waits for the journal or a disk. If they are so slow that a megabyte of lines waits, further lines are
+    // lost, and a line reports their number as soon as there is room. If the journal does not exist, lines go to the
+    // descriptor.
     void write(const LogRecord& record) override;
+    void flush() override { writer_.flush(); }
 
     // Counts lost lines from now on.
     void setLedger(ledger::Ledger& ledger) noexcept { ledger_ = &ledger; }
@@ -54,21 +56,22 @@ public:
     [[nodiscard]] const RecentLogLines& recentLines() const noexcept { return recentLines_; }
 
 private:
-    enum class Sent : std::uint8_t { Yes, Lost, NoJournal };
-
     void connectToJournal(const std::string& path);
-    [[nodiscard]] Sent sendToJournal(const LogRecord& record, std::string_view line);
     void reportLost();
-    void writeToDescriptor(std::string_view line) const;
+    // The following are for the writer's thread.
+    void writeOut(const LogLines& lines);
+    [[nodiscard]] bool sendToJournal(const LogLines::Line& line, std::string_view text);
+    void writeToDescriptor(std::string_view lines) const;
 
     const LogThresholds thresholds_;
     const int descriptor_;
     FileDescriptor journal_; // empty without a journal
     sockaddr_un journalAddress_{};
-    std::atomic<bool> journalIsBehind_ = false;
+    bool journalIsBehind_ = false; // at the end, so that no line waits for it any more
     std::atomic<std::uint64_t> lostLines_ = 0; // since the last line that reported them
     std::atomic<ledger::Ledger*> ledger_ = nullptr;
     RecentLogLines recentLines_;
+    LogWriter writer_{[this](const LogLines& lines) { writeOut(lines); }}; // last: its thread uses the others
 };
 
 } // namespace platform

@@ -94,10 +94,10 @@ TEST(NotifyRoad, ASwitchReachesTheSessionEachTime)
     };
     EXPECT_EQ(tool.print({"notify", "com.quarn.halden.ringerstate", "1"}), "");
     ASSERT_TRUE(told(1));
-    EXPECT_THAT(kestod.log(), HasSubstr(R"(defaults {"ringerstate":true)"));
+    EXPECT_TRUE(kestod.waitForLog(R"(defaults {"ringerstate":true)"));
     EXPECT_EQ(tool.print({"notify", "com.quarn.halden.ringerstate", "2"}), "");
     ASSERT_TRUE(told(2));
-    EXPECT_THAT(kestod.log(), HasSubstr(R"(defaults {"ringerstate":false)"));
+    EXPECT_TRUE(kestod.waitForLog(R"(defaults {"ringerstate":false)"));
     EXPECT_EQ(tool.print({"notify", "com.quarn.halden.ringerstate"}), "");
     EXPECT_TRUE(told(3)) << "the same again";
 }

@@ -75,6 +75,7 @@ protected:
         enable();
         kestod.startAndAwait();
         static_cast<void>(record({}, {"true"}));
+        kestod.awaitLog();
         return !kestod.log().contains("the kernel trace is not available: ");
     }
     [[nodiscard]] std::vector<std::string> namesInTraces() const { return support::namesIn(path("logs/Audio/Traces")); }
