@@ -2,15 +2,11 @@
 // status.
 #pragma once
 
+#include "kesto/ExitStatus.h"
+
 #include <CLI/App.hpp>
 #include <CLI/Config.hpp>
 #include <CLI/Formatter.hpp>
-
-// Exit statuses; 2 is a wrong command line, 3 means incomplete results. `kesto status` has some of its own.
-constexpr int exitOk = 0;
-constexpr int exitFailure = 1;
-constexpr int exitUsage = 2;
-constexpr int exitIncomplete = 3;
 
 // Requires a subcommand. For an unknown word the error names the word, instead of a missing subcommand.
 void requireSubcommand(CLI::App& application);

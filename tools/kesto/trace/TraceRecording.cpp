@@ -2,7 +2,7 @@
 // show whether it can read the parameters, where its results are, and whether the tool can read them.
 #include "kesto/trace/TraceRecording.h"
 
-#include "kesto/Commands.h"
+#include "kesto/ExitStatus.h"
 #include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
 #include "kesto/files/OutputFile.h"

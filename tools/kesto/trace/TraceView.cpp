@@ -2,7 +2,7 @@
 #include "kesto/trace/TraceView.h"
 
 #include "foundation/values/Json.h"
-#include "kesto/Commands.h"
+#include "kesto/ExitStatus.h"
 #include "kesto/Terminal.h"
 #include "kesto/trace/TraceStatistics.h"
 
