@@ -105,20 +105,21 @@ void KestoReportingClientServerInstance::announceSource(platform::Turn& turn) co
                           .time = clientStartDate_.value_or(0)});
 }
 
-void KestoReportingClientServerInstance::addSession(platform::Turn& turn, std::int64_t reporterID, Session session)
+void KestoReportingClientServerInstance::addSession(platform::Turn& turn, std::int64_t reporterID,
+                                                    const Session& session)
 {
     utility::assertServerQueue();
     const std::size_t before = clientReportingSessionMap_.size();
     if (const auto replaced = clientReportingSessionMap_.find(reporterID))
         replaced->announceEnd(turn);
     session->setOwner(source_);
-    clientReportingSessionMap_.set(reporterID, std::move(session));
+    clientReportingSessionMap_.set(reporterID, session);
     const std::size_t added = clientReportingSessionMap_.size() - before;
     sessionsOfTheService += added;
     turn.tally.add(Counter::SessionsCreated);
     turn.tally.add(Counter::SessionsGone, 1 - added); // the one that it replaces
     if (const auto delegate = delegate_.lock())
-        delegate->reporterIDAdded(reporterID, *this);
+        delegate->reporterIDAdded(reporterID, *this, session);
 }
 
 void KestoReportingClientServerInstance::removeSession(platform::Turn& turn, std::int64_t reporterID)

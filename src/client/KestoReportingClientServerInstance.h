@@ -134,7 +134,7 @@ private:
     static void deliverToSession(platform::Turn& turn, const Message& message, const Session& session);
     [[nodiscard]] ledger::Culprit culprit() const;
     void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
-    void addSession(platform::Turn& turn, std::int64_t reporterID, Session session);
+    void addSession(platform::Turn& turn, std::int64_t reporterID, const Session& session);
     void removeSession(platform::Turn& turn, std::int64_t reporterID);
 
     const std::int32_t processIdentifier_;

@@ -54,6 +54,7 @@ public:
     virtual void setActiveSessionCount(std::int64_t count) = 0;
 
     // Reports that the client's session map gained or lost this ID. The look-up over all clients relies on these calls.
-    virtual void reporterIDAdded(std::int64_t reporterID, const KestoReportingClientServerInstance& client) = 0;
+    virtual void reporterIDAdded(std::int64_t reporterID, const KestoReportingClientServerInstance& client,
+                                 const std::shared_ptr<KestoReportingSession>& session) = 0;
     virtual void reporterIDRemoved(std::int64_t reporterID, const KestoReportingClientServerInstance& client) = 0;
 };

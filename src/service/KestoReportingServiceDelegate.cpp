@@ -92,11 +92,12 @@ void KestoReportingServiceDelegate::removeClient(const std::shared_ptr<KestoRepo
 }
 
 void KestoReportingServiceDelegate::reporterIDAdded(std::int64_t reporterID,
-                                                    const KestoReportingClientServerInstance& client)
+                                                    const KestoReportingClientServerInstance& client,
+                                                    const std::shared_ptr<KestoReportingSession>& session)
 {
     utility::assertServerQueue();
     const foundation::Lock lock(lock_);
-    reporterIndex_.add(reporterID, client);
+    reporterIndex_.add(reporterID, client, session);
 }
 
 void KestoReportingServiceDelegate::reporterIDRemoved(std::int64_t reporterID,
@@ -130,12 +131,12 @@ std::shared_ptr<KestoReportingSession> KestoReportingServiceDelegate::findReport
     const foundation::Lock lock(lock_);
     if (reporterID == 0 || !reportingEnabled_)
         return nullptr;
-    const KestoReportingClientServerInstance* client = reporterIndex_.find(reporterID);
-    if (client == nullptr) {
+    const service::ReporterIndex::Holder* found = reporterIndex_.find(reporterID);
+    if (found == nullptr) {
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Error, "failed to find reporting session {}", reporterID);
         return nullptr;
     }
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "found reporting session {} for client {}", reporterID,
-              client->processIdentifier());
-    return client->clientReportingSessionMap().find(reporterID);
+              found->client->processIdentifier());
+    return found->session.lock();
 }

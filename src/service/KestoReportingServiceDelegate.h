@@ -66,7 +66,8 @@ public:
     void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) override;
     [[nodiscard]] std::int64_t activeSessionCount() const override { return activeSessionCount_; }
     void setActiveSessionCount(std::int64_t count) override { activeSessionCount_ = count; }
-    void reporterIDAdded(std::int64_t reporterID, const KestoReportingClientServerInstance& client) override;
+    void reporterIDAdded(std::int64_t reporterID, const KestoReportingClientServerInstance& client,
+                         const std::shared_ptr<KestoReportingSession>& session) override;
     void reporterIDRemoved(std::int64_t reporterID, const KestoReportingClientServerInstance& client) override;
 
 private:

@@ -374,7 +374,10 @@ public:
                 (override));
     MOCK_METHOD(std::int64_t, activeSessionCount, (), (const, override));
     MOCK_METHOD(void, setActiveSessionCount, (std::int64_t), (override));
-    MOCK_METHOD(void, reporterIDAdded, (std::int64_t, const KestoReportingClientServerInstance&), (override));
+    MOCK_METHOD(void, reporterIDAdded,
+                (std::int64_t, const KestoReportingClientServerInstance&,
+                 const std::shared_ptr<KestoReportingSession>&),
+                (override));
     MOCK_METHOD(void, reporterIDRemoved, (std::int64_t, const KestoReportingClientServerInstance&), (override));
 };
 
@@ -695,8 +698,8 @@ TEST_F(ClientAndServiceTest, ShowsTheServicesCountOfActiveSessionsWhateverItIs)
 TEST_F(ClientAndServiceTest, TellsTheServiceWhichIDsItsMapGainsAndLoses)
 {
     const testing::InSequence inOrder;
-    EXPECT_CALL(*service, reporterIDAdded(42, testing::Ref(*client)));
-    EXPECT_CALL(*service, reporterIDAdded(0, testing::Ref(*client)));
+    EXPECT_CALL(*service, reporterIDAdded(42, testing::Ref(*client), testing::_));
+    EXPECT_CALL(*service, reporterIDAdded(0, testing::Ref(*client), testing::_));
     EXPECT_CALL(*service, reporterIDRemoved(42, testing::Ref(*client)));
     EXPECT_CALL(*service, reporterIDRemoved(0, testing::Ref(*client)));
     EXPECT_CALL(*service, removeClient(client));

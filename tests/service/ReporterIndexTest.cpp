@@ -55,13 +55,27 @@ protected:
     BareIndexTest()
     {
         utility::createServerQueue();
-        for (const std::int32_t process : {1001, 1002})
+        for (const std::int32_t process : {1001, 1002}) {
             clients_.push_back(std::make_unique<KestoReportingClientServerInstance>(process, nobody_));
+            sessions_.push_back(std::make_shared<KestoReportingSession>(42, std::vector{process}));
+        }
     }
 
     [[nodiscard]] const KestoReportingClientServerInstance& client(std::size_t number) const
     {
         return *clients_[number];
+    }
+    // The client's session 42.
+    [[nodiscard]] const std::shared_ptr<KestoReportingSession>& session(std::size_t number) const
+    {
+        return sessions_[number];
+    }
+    void add(std::size_t number) { index.add(42, client(number), session(number)); }
+    // The session that the index finds, or null.
+    [[nodiscard]] std::shared_ptr<KestoReportingSession> found() const
+    {
+        const auto* holder = index.find(42);
+        return holder == nullptr ? nullptr : holder->session.lock();
     }
 
     service::ReporterIndex index;
@@ -70,12 +84,13 @@ private:
     const TestPlatform platform_;
     const std::weak_ptr<KestoReportingServiceDelegateProtocol> nobody_;
     std::vector<std::unique_ptr<KestoReportingClientServerInstance>> clients_;
+    std::vector<std::shared_ptr<KestoReportingSession>> sessions_;
 };
 
 TEST_F(BareIndexTest, DoesNotCountClientsThatAreNotRegistered)
 {
-    index.add(42, client(0));
-    EXPECT_EQ(index.find(42), nullptr);
+    add(0);
+    EXPECT_EQ(found(), nullptr);
     index.remove(42, client(0));
 }
 
@@ -83,23 +98,50 @@ TEST_F(BareIndexTest, KeepsTheOrderOfRegistrationForAnyOrderOfCreation)
 {
     index.registerClient(client(1));
     index.registerClient(client(0));
-    index.add(42, client(0));
-    EXPECT_EQ(index.find(42), &client(0));
-    index.add(42, client(1));
-    EXPECT_EQ(index.find(42), &client(1));
+    add(0);
+    EXPECT_EQ(found(), session(0));
+    add(1);
+    EXPECT_EQ(found(), session(1));
     index.remove(42, client(1));
-    EXPECT_EQ(index.find(42), &client(0));
+    EXPECT_EQ(found(), session(0));
 }
 
 TEST_F(BareIndexTest, CountsAnIDOnceAndForgetsItAtOnce)
 {
     index.registerClient(client(0));
-    index.add(42, client(0));
-    index.add(42, client(0));
+    add(0);
+    add(0);
     index.remove(42, client(0));
-    EXPECT_EQ(index.find(42), nullptr);
+    EXPECT_EQ(found(), nullptr);
     index.remove(42, client(0));
-    EXPECT_EQ(index.find(42), nullptr);
+    EXPECT_EQ(found(), nullptr);
+}
+
+TEST_F(BareIndexTest, FindsTheSessionThatReplacedAnother)
+{
+    index.registerClient(client(0));
+    index.registerClient(client(1));
+    add(0);
+    index.add(42, client(0), session(1));
+    EXPECT_EQ(found(), session(1));
+    EXPECT_EQ(index.find(42)->client, &client(0));
+    add(1);
+    index.add(42, client(1), session(0));
+    index.remove(42, client(0));
+    EXPECT_EQ(found(), session(0));
+    EXPECT_EQ(index.find(42)->client, &client(1));
+}
+
+TEST_F(BareIndexTest, AClientThatCameLaterGoesWithoutATrace)
+{
+    index.registerClient(client(0));
+    index.registerClient(client(1));
+    add(0);
+    add(1);
+    index.remove(42, client(1));
+    EXPECT_EQ(found(), session(0));
+    index.remove(42, client(0));
+    EXPECT_EQ(found(), nullptr);
 }
 
 TEST_F(BareIndexTest, PutsAClientThatComesAgainBehindTheOthers)
@@ -108,9 +150,9 @@ TEST_F(BareIndexTest, PutsAClientThatComesAgainBehindTheOthers)
     index.registerClient(client(1));
     index.unregisterClient(client(0));
     index.registerClient(client(0));
-    index.add(42, client(0));
-    index.add(42, client(1));
-    EXPECT_EQ(index.find(42), &client(1));
+    add(0);
+    add(1);
+    EXPECT_EQ(found(), session(1));
 }
 
 } // namespace
