@@ -4,13 +4,13 @@
 #include "foundation/cbor/Cbor.h"
 #include "foundation/text/Format.h"
 #include "platform/Platform.h"
-#include "sinks/KestoReportingFennicBridge.h"
 #include "tracing/TraceParams.h"
 #include "tracing/TraceRunner.h"
 #include "utility/KestoReportingUtility.h"
 #include "utility/ServerQueue.h"
 #include "utility/ServiceTraceCodes.h"
 
+#include <cassert>
 #include <utility>
 
 namespace {
@@ -183,81 +183,87 @@ void KestoReportingSession::start()
         return;
     }
     started_ = true;
-    messagesLost_ = 0;
     {
-        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        nestedAggregatedPayloadData_ = std::make_shared<session::MessageStore>(budget_);
+        const foundation::Lock lock(runLock_);
+        run_ = std::make_shared<session::Run>(reporterID_, budget_);
     }
     utility::emitTraceCode(utility::ServiceTraceCode::SessionStarted);
     startTracing();
 }
 
+// The session shares its run with the end, and counts as started until that is over.
 void KestoReportingSession::stop(platform::Turn& turn)
 {
     utility::assertServerQueue();
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     if (!started_)
         return;
+    const auto end = makeRunEnd();
+    end->makeVolumeEvents();
+    while (end->hasVolumeEvents())
+        end->sendVolumeEvent(turn, shared_from_this());
+    end->summarise();
+    finishStop(turn, *end);
+}
+
+std::unique_ptr<session::RunEnd> KestoReportingSession::beginStop()
+{
+    utility::assertServerQueue();
+    assert(started_);
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
-    utility::emitTraceCode(utility::ServiceTraceCode::SessionStopping);
-    sendVolumeEvents(turn);
-    writeSummaryJson();
-    sendSummaryEvent(turn.tally);
+    auto end = makeRunEnd();
+    letGoOfMessages();
+    started_ = false;
+    return end;
+}
+
+void KestoReportingSession::finishStop(platform::Turn& turn, session::RunEnd& end)
+{
+    utility::assertServerQueue();
+    end.addTo(turn.tally);
     turn.tally.add(ledger::Counter::SessionsStopped);
     stopTracing();
-    if (messagesLost_ != 0)
+    if (end.messagesLost() != 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for lack of memory", reporterID_,
-                  messagesLost_);
+                  end.messagesLost());
+    end.letGo();
     letGoOfMessages();
     started_ = false;
 }
 
+std::unique_ptr<session::RunEnd> KestoReportingSession::makeRunEnd() const
+{
+    KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
+    utility::emitTraceCode(utility::ServiceTraceCode::SessionStopping);
+    return std::make_unique<session::RunEnd>(session::RunEnd::Facts{.reporterID = reporterID_,
+                                                                    .serviceType = serviceType_,
+                                                                    .configuration = configuration(),
+                                                                    .culprit = culprit(),
+                                                                    .budget = budget_},
+                                             run());
+}
+
+// What ends sooner than another thread is woken, ends here. Ordinary messages of so many bytes take 0.1 ms, and those
+// with as many different keys as there is room for, 2 ms. A file always takes long.
+bool KestoReportingSession::takesLongToStop() const
+{
+    constexpr std::size_t fewMessages = 512;
+    constexpr std::size_t fewBytes = std::size_t{48} << 10;
+    const auto run = this->run();
+    if (!run || run->store().empty())
+        return false;
+    const session::MessageStore& store = run->store();
+    return store.size() > fewMessages || store.bytes() > fewBytes || KestoReportingUtilityIsInternalBuild();
+}
+
 void KestoReportingSession::letGoOfMessages()
 {
-    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    nestedAggregatedPayloadData_.reset();
+    const foundation::Lock lock(runLock_);
+    run_.reset();
 }
 
-// The caller reads the store without the lock, under which recorders would wait for a disk. This is safe: the thread
-// that stops the session is the one that records.
-std::shared_ptr<const session::MessageStore> KestoReportingSession::store() const
+std::shared_ptr<session::Run> KestoReportingSession::run() const
 {
-    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    return nestedAggregatedPayloadData_;
-}
-
-void KestoReportingSession::sendVolumeEvents(platform::Turn& turn)
-{
-    const auto application = KestoReportingUtilityRetrieveAppName(configuration());
-    const auto process = application.isNull() ? std::nullopt : std::optional(application);
-    const double minimumPlaytime = KestoReportingUtilityVolumeMinimumPlayingTime(serviceType_);
-    session::StorageShare share(budget_);
-    auto volumeEvents = createVolumeMessages(*store(), process, minimumPlaytime, share);
-    if (volumeEvents.empty())
-        return;
-    KESTO_LOG(KestoReportingSessionCategory(), Default, "sending volume event for reporter {}", reporterID_);
-    std::size_t roughBytes = 0;
-    for (const auto& event : volumeEvents)
-        roughBytes += event.roughBytes();
-    const double paidForAByte = static_cast<double>(share.bytes()) / static_cast<double>(roughBytes);
-    for (auto& next : volumeEvents) {
-        const auto volumeEvent = std::exchange(next, {}); // freed as soon as the store has it
-        share.shrink(static_cast<std::size_t>(static_cast<double>(volumeEvent.roughBytes()) * paidForAByte));
-        sendMessage(turn.tally, volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary, true, nullptr);
-        KestoReportingFennicBridge::handleEvent(turn, volumeEvent, AudioEventCategoryVolume, AudioEventTypeSummary,
-                                                shared_from_this());
-    }
-}
-
-void KestoReportingSession::sendSummaryEvent(ledger::Tally& tally)
-{
-    const auto summary = createSummaryEventForSession();
-    if (!summary)
-        return;
-    KESTO_LOG(KestoReportingSessionCategory(), Default, "sending summary event for reporter {}", reporterID_);
-    {
-        const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-        nestedAggregatedPayloadData_->keepLargePayloadsAsTheyCome(); // no analysis reads them any more
-    }
-    sendMessage(tally, summary, AudioEventCategoryUndefined, AudioEventTypeUnknown, true, nullptr);
+    const foundation::Lock lock(runLock_);
+    return run_;
 }

@@ -10,6 +10,8 @@
 #include "ledger/Tally.h"
 #include "session/DriverSnapShot.h"
 #include "session/MessageStore.h"
+#include "session/Run.h"
+#include "session/RunEnd.h"
 #include "sinks/SinkSession.h"
 #include "utility/Reply.h"
 
@@ -74,6 +76,13 @@ public:
     // Ends the run and drops the recorded messages; the events made of them go with the turn. Has no effect on a
     // session that is not started.
     void stop(platform::Turn& turn);
+    // Whether that would take so long that other clients should not wait for it.
+    [[nodiscard]] bool takesLongToStop() const;
+    // The same as a stop, in two parts, for a session that is started. The first takes the run out of the session,
+    // which is stopped from then on; the caller carries out the steps of its end, and then calls the second. Nothing
+    // may start the session in between.
+    [[nodiscard]] std::unique_ptr<session::RunEnd> beginStop();
+    void finishStop(platform::Turn& turn, session::RunEnd& end);
 
     // Whether sessions of this service type may run kernel traces: those for tests, where the feature is enabled and
     // the system can trace.
@@ -124,8 +133,9 @@ public:
     createVolumeMessages(const session::MessageStore& messages, const std::optional<foundation::Value>& process,
                          double minimumPlaytime, session::StorageShare& share);
     static constexpr std::size_t mostVolumeEventBytes = std::size_t{64} << 20;
-    // A client that has used up its budget still gets the first few events of what it played. They take memory from no
-    // other client, because only one session ends at a time.
+    // A client that has used up its budget still gets the first few events of what it played. They take next to no
+    // memory from other clients, because only one session ends on a thread of its own at a time, and one on the server
+    // queue.
     static constexpr std::size_t unpaidVolumeEventBytes = std::size_t{64} << 10;
 
     // The limit for the summary files of all sessions. Beyond it the oldest are removed.
@@ -166,10 +176,8 @@ public:
     [[nodiscard]] static bool shouldReportOrientation() { return false; }
 
 private:
-    [[nodiscard]] std::shared_ptr<const session::MessageStore> store() const;
-    [[nodiscard]] std::string summaryFileName() const;
-    void sendVolumeEvents(platform::Turn& turn);
-    void sendSummaryEvent(ledger::Tally& tally);
+    [[nodiscard]] std::shared_ptr<session::Run> run() const;
+    [[nodiscard]] std::unique_ptr<session::RunEnd> makeRunEnd() const;
     void letGoOfMessages();
     void startTracing();
     void stopTracing();
@@ -184,8 +192,7 @@ private:
     utility::ResultReply<bool> transactionCompleteBlock_;
     const std::int64_t reporterID_;
     const std::vector<std::int32_t> processIdentifiers_;
-    std::shared_ptr<session::MessageStore>
-        nestedAggregatedPayloadData_ KESTO_GUARDED_BY(nestedAggregatedPayloadDataLock_);
+    std::shared_ptr<session::Run> run_ KESTO_GUARDED_BY(runLock_); // null unless it is started
     std::string_view serviceName_;
     platform::Origin origin_;
     double created_ = 0; // seconds since 1970
@@ -201,7 +208,6 @@ private:
     const std::shared_ptr<session::StorageBudget> budget_;
     session::StorageShare configurationShare_ KESTO_GUARDED_BY(configurationLock_);
     session::StorageShare driverSnapShotShare_;
-    mutable std::uint64_t messagesLost_ = 0; // in this run, for lack of memory
     mutable foundation::Mutex configurationLock_;
-    mutable foundation::Mutex nestedAggregatedPayloadDataLock_;
+    mutable foundation::Mutex runLock_;
 };

@@ -4,7 +4,6 @@
 #include "session/KestoReportingSession.h"
 #include "utility/KestoReportingUtility.h"
 #include "utility/ServerQueue.h"
-#include "utility/ServiceTraceCodes.h"
 
 #include <chrono>
 #include <random>
@@ -14,10 +13,9 @@ void KestoReportingSession::sendMessage(ledger::Tally& tally, const std::optiona
                                         const MessageReply& reply)
 {
     utility::assertServerQueue();
-    KESTO_LOG(KestoReportingSessionCategory(), Debug, "sending message for session owned by {}", reporterID_);
-    createMessageIdentifier(tally, category, type,
-                            utility::normaliseMessage(message.value_or(foundation::Dictionary()), category, type));
-    utility::emitTraceCode(utility::ServiceTraceCode::SessionMessageAccepted);
+    session::Run::receive(
+        reporterID_, message.value_or(foundation::Dictionary()), category, type,
+        [&](const foundation::Dictionary& normalised) { createMessageIdentifier(tally, category, type, normalised); });
     if (reply)
         reply(std::nullopt);
 }
@@ -31,25 +29,11 @@ void KestoReportingSession::sendMessage(ledger::Tally& tally, const std::optiona
 bool KestoReportingSession::createMessageIdentifier(ledger::Tally& tally, AudioEventCategory category,
                                                     AudioEventType type, const foundation::Dictionary& message)
 {
-    using ledger::Counter;
-    tally.add(Counter::Deliveries);
-    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    if (!nestedAggregatedPayloadData_) {
-        tally.add(Counter::Inert);
-        return false;
-    }
-    switch (nestedAggregatedPayloadData_->record(category, type, message)) {
-    case session::MessageStore::Outcome::Recorded: tally.add(Counter::Recorded); return false;
-    case session::MessageStore::Outcome::Redundant:
-        tally.add(Counter::Repeated);
-        KESTO_LOG(KestoReportingSessionCategory(), Debug, "dropping redundant event");
-        return true;
-    case session::MessageStore::Outcome::Full: break;
-    }
-    tally.add(Counter::RefusedForMemory, culprit());
-    if (messagesLost_++ == 0)
-        KESTO_LOG(KestoReportingSessionCategory(), Error,
-                  "no memory left for the messages of session {}; they are lost until sessions stop", reporterID_);
+    const foundation::Lock lock(runLock_);
+    if (run_)
+        return run_->record(tally, category, type, message, [this] { return culprit(); });
+    tally.add(ledger::Counter::Deliveries);
+    tally.add(ledger::Counter::Inert);
     return false;
 }
 
@@ -70,21 +54,12 @@ void KestoReportingSession::sendSingleMessage(const foundation::Dictionary&, Aud
 
 std::optional<std::vector<foundation::Dictionary>> KestoReportingSession::nestedAggregatedPayloadData() const
 {
-    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    if (!nestedAggregatedPayloadData_)
-        return std::nullopt;
-    const session::MessageStore& store = *nestedAggregatedPayloadData_;
-    std::vector<foundation::Dictionary> messages;
-    store.forEach([&](const session::MessageStore::Message& message) {
-        messages.push_back({{foundation::String(store.identifier(message)), message.payload.dictionary()}});
-    });
-    return messages;
+    const auto run = this->run();
+    return run ? std::optional(run->messages()) : std::nullopt;
 }
 
 std::optional<foundation::Dictionary> KestoReportingSession::messageIdentifierCounts() const
 {
-    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    if (!nestedAggregatedPayloadData_)
-        return std::nullopt;
-    return nestedAggregatedPayloadData_->counts();
+    const auto run = this->run();
+    return run ? std::optional(run->counts()) : std::nullopt;
 }

@@ -191,19 +191,46 @@ bool writeJson(const session::MessageStore& store, foundation::PrettyJsonWriter:
     return writer.isWhole();
 }
 
+// The name of the file for messages that are written now.
+std::string summaryFileName(AudioServiceType serviceType, const Dictionary& configuration)
+{
+    constexpr std::size_t longestName = 255; // of any file system
+    const std::string time =
+        foundation::localTimeText(platform::current().clock.secondsSince1970(), "{:%Y%m%d-%H%M%S%z}");
+    const std::string beginning = foundation::format("{}-kesto-", time);
+    const std::string end =
+        foundation::format("-{}.json", KestoReportingUtilityGenerateServiceNameFromServiceType(serviceType));
+    const std::string application = KestoReportingUtilityRetrieveAppName(configuration).text();
+    return beginning + fileNamePart(application, longestName - beginning.size() - end.size()) + end;
+}
+
 } // namespace
 
 std::optional<Dictionary> KestoReportingSession::createSummaryEventForSession() const
 {
-    const foundation::Lock lock(nestedAggregatedPayloadDataLock_);
-    if (!nestedAggregatedPayloadData_ || nestedAggregatedPayloadData_->empty())
+    const auto run = this->run();
+    return run ? run->createSummaryEvent(serviceType_) : std::nullopt;
+}
+
+void KestoReportingSession::writeSummaryJson() const
+{
+    if (const auto run = this->run())
+        run->writeSummaryFile(serviceType_, configuration());
+}
+
+namespace session {
+
+std::optional<Dictionary> Run::createSummaryEvent(AudioServiceType type)
+{
+    const foundation::Lock lock(lock_);
+    if (store_.empty())
         return std::nullopt;
     std::string serviceType;
-    foundation::appendCbor(foundation::Value(serviceType_.load()), serviceType);
+    foundation::appendCbor(foundation::Value(type), serviceType);
     ValuesByKey values(budget_);
     values.append(values.positionOf(summaryKey), foundation::CborItem(serviceType));
-    session::EntryReader<std::size_t> entries;
-    session::MessageStore::Cursor cursor(*nestedAggregatedPayloadData_);
+    EntryReader<std::size_t> entries;
+    MessageStore::Cursor cursor(store_);
     while (!values.isOutOfMemory() && cursor.next())
         entries.read(
             cursor.kind(), cursor.payload(), [&](std::string_view key) { return values.positionOf(key); },
@@ -218,19 +245,18 @@ std::optional<Dictionary> KestoReportingSession::createSummaryEventForSession() 
     return summary;
 }
 
-void KestoReportingSession::writeSummaryJson() const
+void Run::writeSummaryFile(AudioServiceType serviceType, const Dictionary& configuration) const
 {
-    const auto store = this->store();
-    if (!KestoReportingUtilityIsInternalBuild() || !store || store->empty())
+    if (!KestoReportingUtilityIsInternalBuild() || store_.empty())
         return;
     platform::FileSystem& files = platform::current().fileSystem;
     const std::filesystem::path directory = files.diagnosticLogRoot() / summaryDirectory;
     const auto directoryMade = files.createDirectories(directory, summaryDirectoryPermissions);
-    const std::filesystem::path path = directory / summaryFileName();
+    const std::filesystem::path path = directory / summaryFileName(serviceType, configuration);
     const auto file = files.createAtomically(path);
 
     std::uint64_t bytes = 0;
-    const bool isSerialised = writeJson(*store, [&](std::string_view text) {
+    const bool isSerialised = writeJson(store_, [&](std::string_view text) {
         bytes += text.size();
         if (file)
             (*file)->write(text);
@@ -247,7 +273,10 @@ void KestoReportingSession::writeSummaryJson() const
 
     auto written = file ? (*file)->commit() : std::unexpected(file.error());
     if (written)
-        files.keepWithin(directory, {mostSummaryFiles, mostSummaryBytes, isSummaryFileName}, bytes);
+        files.keepWithin(
+            directory,
+            {KestoReportingSession::mostSummaryFiles, KestoReportingSession::mostSummaryBytes, isSummaryFileName},
+            bytes);
     if (written && !directoryMade)
         written = std::unexpected(directoryMade.error());
     if (written)
@@ -256,14 +285,4 @@ void KestoReportingSession::writeSummaryJson() const
         KESTO_LOG(KestoReportingSessionCategory(), Error, "jsonOutput writeToURL: {}", written.error().message());
 }
 
-std::string KestoReportingSession::summaryFileName() const
-{
-    constexpr std::size_t longestName = 255; // of any file system
-    const std::string time =
-        foundation::localTimeText(platform::current().clock.secondsSince1970(), "{:%Y%m%d-%H%M%S%z}");
-    const std::string beginning = foundation::format("{}-kesto-", time);
-    const std::string end =
-        foundation::format("-{}.json", KestoReportingUtilityGenerateServiceNameFromServiceType(serviceType_));
-    const std::string application = KestoReportingUtilityRetrieveAppName(configuration()).text();
-    return beginning + fileNamePart(application, longestName - beginning.size() - end.size()) + end;
-}
+} // namespace session

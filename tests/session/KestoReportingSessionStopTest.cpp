@@ -120,6 +120,136 @@ TEST_F(SessionStop, CountsAsStartedUntilItIsOver)
     EXPECT_FALSE(session->started());
 }
 
+// What the steps of a run's end do, in the order in which a thread of its own and the server queue carry them out.
+void stopInParts(const std::shared_ptr<KestoReportingSession>& session, platform::Turn& turn)
+{
+    const auto end = session->beginStop();
+    end->makeVolumeEvents();
+    while (end->hasVolumeEvents())
+        end->sendVolumeEvent(turn, session);
+    end->summarise();
+    end->letGo();
+    session->finishStop(turn, *end);
+}
+
+TEST_F(SessionStop, InPartsSaysAndMarksAndSendsAndCountsTheSameAsAtOnce)
+{
+    struct Effects {
+        std::vector<std::string> lines;
+        std::vector<std::uint32_t> codes;
+        std::vector<Dictionary> events;
+        std::string file;
+        ledger::Tally::Counts counts;
+    };
+    const auto linesOfTheLog = [&] {
+        std::vector<std::string> lines;
+        for (const support::LogLine& line : platform.log.lines())
+            lines.push_back(std::to_string(static_cast<int>(line.level)) + line.tag + ' ' + line.message);
+        return lines;
+    };
+    const auto effectsOf = [&](auto stopIt) {
+        session->start();
+        play();
+        platform.log.clear();
+        platform.traceEmitter.take();
+        platform.analytics.clear();
+        platform.fileSystem.files.clear();
+        platform.turn.tally.clear();
+        stopIt();
+        return Effects{.lines = linesOfTheLog(),
+                       .codes = platform.traceEmitter.take(),
+                       .events = platform.analytics.payloads("com.quarn.longformaudio.Volume.Summary"),
+                       .file = platform.fileSystem.files.begin()->second,
+                       .counts = platform.turn.tally.counts()};
+    };
+    session->stop(platform.turn);
+    const Effects atOnce = effectsOf([&] { session->stop(platform.turn); });
+    const Effects inParts = effectsOf([&] { stopInParts(session, platform.turn); });
+    EXPECT_THAT(inParts.lines, SizeIs(12));
+    EXPECT_EQ(inParts.lines, atOnce.lines);
+    EXPECT_THAT(inParts.codes,
+                ElementsAre(sessionStopping, sessionMessageAccepted, sessionMessageAccepted, sessionMessageAccepted));
+    EXPECT_THAT(inParts.events, SizeIs(2));
+    EXPECT_EQ(inParts.events, atOnce.events);
+    EXPECT_THAT(inParts.file, HasSubstr("\"Volume_Summary_2\": {"));
+    EXPECT_EQ(inParts.file, atOnce.file);
+    EXPECT_EQ(inParts.counts, atOnce.counts);
+    EXPECT_EQ(platform.turn.tally[ledger::Counter::SessionsStopped], 1U);
+    EXPECT_EQ(platform.turn.tally[ledger::Counter::Recorded], 3U) << "two volume events, and the summary";
+}
+
+TEST_F(SessionStop, InPartsLeavesTheSessionStoppedFromTheFirstPartOn)
+{
+    play();
+    const auto end = session->beginStop();
+    EXPECT_FALSE(session->started());
+    EXPECT_EQ(session->nestedAggregatedPayloadData(), std::nullopt);
+    EXPECT_EQ(session->messageIdentifierCounts(), std::nullopt);
+    platform.turn.tally.clear();
+    send(110, {{"a", 1}});
+    EXPECT_EQ(platform.turn.tally[ledger::Counter::Inert], 1U);
+    end->makeVolumeEvents();
+    while (end->hasVolumeEvents())
+        end->sendVolumeEvent(platform.turn, session);
+    end->summarise();
+    EXPECT_THAT(platform.fileSystem.files.begin()->second, Not(HasSubstr("\"a\": 1")));
+}
+
+TEST_F(SessionStop, InPartsLetsGoOfTheMessagesWithTheRun)
+{
+    send(0, {{"a", std::string(100'000, 'x')}});
+    const auto end = session->beginStop();
+    end->makeVolumeEvents();
+    end->summarise();
+    const std::size_t before = platform.memory.bytesLetGo();
+    end->letGo();
+    EXPECT_GT(platform.memory.bytesLetGo() - before, 100'000U);
+}
+
+TEST_F(SessionStop, InPartsSaysHowManyMessagesWereLost)
+{
+    const auto budget = std::make_shared<session::StorageBudget>(1024);
+    session = std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7}, budget);
+    session->start();
+    for (int message = 0; message < 100; ++message)
+        send(100, {{"a", message}});
+    const auto lost = platform.turn.tally[ledger::Counter::RefusedForMemory];
+    stopInParts(session, platform.turn);
+    EXPECT_GT(lost, 0U);
+    EXPECT_THAT(
+        platform.log.lines("kerr"),
+        Contains(IsLine(Error, "kerr", "session 42 lost " + std::to_string(lost + 1) + " messages for lack of memory")))
+        << "with the summary";
+    EXPECT_EQ(budget->taken(), 0U);
+}
+
+// Others should not wait for a file, nor for many messages.
+TEST_F(SessionStop, TakesLongOnInternalBuildsUnlessNothingWasRecorded)
+{
+    EXPECT_FALSE(session->takesLongToStop());
+    send(0, {{"a", 1}});
+    EXPECT_TRUE(session->takesLongToStop());
+    session->stop(platform.turn);
+    EXPECT_FALSE(session->takesLongToStop());
+}
+
+TEST_F(CustomerSessionStop, TakesLongWithManyMessages)
+{
+    for (int message = 0; message < 512; ++message)
+        send(0, {{"a", message}});
+    EXPECT_FALSE(session->takesLongToStop());
+    send(0, {{"a", 512}});
+    EXPECT_TRUE(session->takesLongToStop());
+}
+
+TEST_F(CustomerSessionStop, TakesLongWithMuchText)
+{
+    send(0, {{"a", std::string(20'000, 'x')}});
+    EXPECT_FALSE(session->takesLongToStop());
+    send(0, {{"a", std::string(100'000, 'x')}});
+    EXPECT_TRUE(session->takesLongToStop());
+}
+
 TEST_F(SessionStop, SaysWhatItDoesAtItsLevel)
 {
     play();
