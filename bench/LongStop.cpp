@@ -1,5 +1,5 @@
-// How long other clients wait while a session with a million messages ends. The server queue runs one item at a time,
-// so they wait for that item; the row shows that they wait for it only once.
+// How long other clients wait at most while a session with a million messages ends. The end is on a thread of its own,
+// with which they share the processors and the service's memory.
 #include "Groups.h"
 #include "support/ServiceProcess.h"
 

@@ -262,23 +262,26 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
             return finish(turn);
         self.withDriverMoment(turn, *delegate,
                               [session, finish](auto& client, platform::Turn& later, const auto& moment) {
-                                  if (const auto service = client.delegate_.lock())
-                                      client.stop(later, *service, session, moment);
-                                  finish(later);
+                                  const auto service = client.delegate_.lock();
+                                  if (!service)
+                                      return finish(later);
+                                  service->sendDriverLogsForSession(later, session, moment);
+                                  session->setDriverSnapShot(std::nullopt);
+                                  client.stopAndThen(later, session, [session, finish](auto& me, platform::Turn& last) {
+                                      me.completeStop(last, session);
+                                      finish(last);
+                                  });
                               });
     });
 }
 
-void KestoReportingClientServerInstance::stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
-                                              const Session& session, const session::DriverMoment& moment)
+void KestoReportingClientServerInstance::completeStop(platform::Turn& turn, const Session& session)
 {
-    delegate.sendDriverLogsForSession(turn, session, moment);
-    session->setDriverSnapShot(std::nullopt);
-    session->stop(turn);
     if (const auto& complete = session->transactionCompleteBlock())
         complete(turn, std::nullopt, true);
     session->setTransactionCompleteBlock(nullptr);
-    logActiveSessions(delegate);
+    if (const auto delegate = delegate_.lock())
+        logActiveSessions(*delegate);
 }
 
 void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID, SuccessReply reply)
@@ -288,13 +291,16 @@ void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t re
         utility::emitTraceCode(utility::ServiceTraceCode::ClientDestroy);
         if (reporterID == 0)
             return reply(turn, std::nullopt, true);
-        if (const auto session = self.clientReportingSessionMap_.find(reporterID)) {
-            if (session->started())
-                session->stop(turn);
-            self.removeSession(turn, reporterID);
-        }
-        KESTO_LOG(KestoReportingClientCategory(), Default, "destroying {}", reporterID);
-        reply(turn, std::nullopt, true);
+        const auto finish = [reporterID, reply](auto& client, platform::Turn& last) {
+            client.removeSession(last, reporterID);
+            KESTO_LOG(KestoReportingClientCategory(), Default, "destroying {}", reporterID);
+            reply(last, std::nullopt, true);
+        };
+        auto session = self.clientReportingSessionMap_.find(reporterID);
+        if (session && session->started())
+            return self.stopAndThen(turn, std::move(session), finish);
+        session.reset(); // the map's is the last, so that the session goes before the answer
+        finish(self, turn);
     });
 }
 
@@ -316,12 +322,25 @@ void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
     submitLong([reply = std::move(reply)](auto& self, platform::Turn& turn) {
         if (self.isConnectionLost_) // the calls that it left waiting must not delay others
             return;
-        std::vector<foundation::Value> reporterIDs;
-        if (const auto delegate = self.delegate_.lock())
-            for (const auto& client : delegate->getAllClients())
-                for (const auto& entry : client->clientReportingSessionMap())
-                    reporterIDs.emplace_back(entry.reporterID);
-        reply(turn, std::nullopt, std::move(reporterIDs));
+        struct Collected {
+            KestoReportingServiceDelegateProtocol::Clients clients;
+            std::size_t next = 0;
+            std::vector<foundation::Value> reporterIDs = {};
+        };
+        const auto delegate = self.delegate_.lock();
+        const auto all =
+            std::make_shared<Collected>(delegate ? delegate->getAllClients() : decltype(Collected::clients)());
+        const auto collectNext = [all](auto&, platform::Turn&) {
+            if (all->next == all->clients.size())
+                return false;
+            for (const auto& entry : all->clients[all->next++]->clientReportingSessionMap())
+                all->reporterIDs.emplace_back(entry.reporterID);
+            return true;
+        };
+        self.inSlices(turn, collectNext, [all, reply](auto& client, platform::Turn& last) {
+            if (!client.isConnectionLost_)
+                reply(last, std::nullopt, std::move(all->reporterIDs));
+        });
     });
 }
 
@@ -344,15 +363,49 @@ void KestoReportingClientServerInstance::handleConnectionError()
         const auto delegate = self.delegate_.lock();
         if (!delegate || !isRegistered(*delegate, self))
             return;
-        std::vector<std::int64_t> reporterIDs;
-        for (const auto& [reporterID, session] : self.clientReportingSessionMap_) {
-            reporterIDs.push_back(reporterID);
-            if (session->started())
-                session->stop(turn);
-        }
-        std::ranges::for_each(reporterIDs, [&](std::int64_t reporterID) { self.removeSession(turn, reporterID); });
-        turn.events.announceSourceEnd({self.source_, platform::current().clock.secondsSince1970()});
-        delegate->removeClient(self.shared_from_this());
+        const auto started = std::make_shared<std::vector<Session>>();
+        for (const auto& entry : self.clientReportingSessionMap_)
+            if (entry.session->started())
+                started->push_back(entry.session);
+        std::ranges::reverse(*started);
+        self.stopAll(turn, started);
+    });
+}
+
+// From the last to the first. A long session is set aside; many short ones take long, too.
+void KestoReportingClientServerInstance::stopAll(platform::Turn& turn,
+                                                 const std::shared_ptr<std::vector<Session>>& sessions)
+{
+    const auto stopShort = [sessions](auto&, platform::Turn& now) {
+        if (sessions->empty() || sessions->back()->takesLongToStop())
+            return false;
+        sessions->back()->stop(now);
+        sessions->pop_back();
+        return true;
+    };
+    inSlices(turn, stopShort, [sessions](auto& self, platform::Turn& now) {
+        if (sessions->empty())
+            return self.leave(now);
+        Session session = std::move(sessions->back());
+        sessions->pop_back();
+        self.stopAndThen(now, std::move(session),
+                         [sessions](auto& client, platform::Turn& later) { client.stopAll(later, sessions); });
+    });
+}
+
+// Removes all sessions, and then the client.
+void KestoReportingClientServerInstance::leave(platform::Turn& turn)
+{
+    const auto removeNext = [](auto& self, platform::Turn& now) {
+        if (self.clientReportingSessionMap_.size() == 0)
+            return false;
+        self.removeSession(now, self.clientReportingSessionMap_.begin()->reporterID);
+        return true;
+    };
+    inSlices(turn, removeNext, [](auto& self, platform::Turn& now) {
+        now.events.announceSourceEnd({self.source_, platform::current().clock.secondsSince1970()});
+        if (const auto delegate = self.delegate_.lock())
+            delegate->removeClient(self.shared_from_this());
         KESTO_LOG(KestoReportingClientCategory(), Default, "removing {} from the server client list",
                   self.processIdentifier_);
     });

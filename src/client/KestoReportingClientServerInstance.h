@@ -11,12 +11,15 @@
 #include "foundation/Mutex.h"
 #include "session/StorageBudget.h"
 #include "utility/ServerQueue.h"
+#include "utility/Slice.h"
 
 #include <atomic>
 #include <cstdint>
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
+#include <vector>
 
 // Always owned by a shared pointer. The operations of the protocol run on a connection thread, and everything else on
 // the server queue, unless a comment says otherwise.
@@ -88,18 +91,30 @@ private:
         std::uint64_t source; // the connection that it came over
     };
     using Session = std::shared_ptr<KestoReportingSession>;
+    // A message on its way, and how far it has come.
+    struct Delivery {
+        Message message;
+        std::optional<ReporterIDs> reporterIDs;
+        utility::Reply reply;
+        std::vector<std::weak_ptr<KestoReportingSession>> sessions = {}; // without a list: those that were started
+        std::size_t next = 0; // in the one list or the other
+        std::size_t room = 0; // for further receivers of the IDs
+        std::size_t refused = 0;
+
+        [[nodiscard]] bool mayTakeLong() const;
+    };
 
     // Runs `work(*this, turn)` on the server queue, with this object kept alive.
     template <typename Work> void submit(Work work)
     {
         queue_->submit(
-            [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
+            [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) mutable { work(*self, turn); });
     }
     // The same for work that takes long with many messages, sessions or channels.
     template <typename Work> void submitLong(Work work)
     {
         queue_->submitLong(
-            [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) { work(*self, turn); });
+            [self = shared_from_this(), work = std::move(work)](platform::Turn& turn) mutable { work(*self, turn); });
     }
     // Runs `work(*this, turn, moment)` with the drivers' channels, which are read now. It runs at once if there are
     // none to read; otherwise later, and this client's next calls wait for it. For an item of `submitLong`, as its last
@@ -116,14 +131,46 @@ private:
             });
         });
     }
+    // Calls `step(*this, turn)` until it returns false, and then `then(*this, turn)`. If this takes long, other
+    // clients' calls run in between; this client's next calls wait. For an item of `submitLong`, as its last step.
+    template <typename Step, typename Then> void inSlices(platform::Turn& turn, Step step, Then then)
+    {
+        const utility::Slice slice;
+        while (step(*this, turn))
+            if (slice.isOver())
+                return queue_->pause()([self = shared_from_this(), step = std::move(step),
+                                        then = std::move(then)](platform::Turn& next) mutable {
+                    self->inSlices(next, std::move(step), std::move(then));
+                });
+        then(*this, turn);
+    }
+    // Stops the session and then calls `then(*this, turn)`: at once, or, if the session is long, later, and this
+    // client's next calls wait for it. For an item of `submitLong`, as its last step.
+    template <typename Then> void stopAndThen(platform::Turn& turn, Session session, Then then)
+    {
+        const auto delegate = delegate_.lock();
+        if (const auto ends = delegate ? delegate->sessionEnds() : nullptr)
+            return ends->stop(turn, std::move(session), queue_,
+                              [self = shared_from_this(), then = std::move(then)](platform::Turn& later) mutable {
+                                  then(*self, later);
+                              });
+        session->stop(turn);
+        session.reset();
+        then(*this, turn);
+    }
     void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
                const session::DriverMoment& moment, const SuccessReply& reply);
-    void stop(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
-              const session::DriverMoment& moment);
-    void deliverToReporters(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
-                            const Message& message, const ReporterIDs& reporterIDs);
-    void deliverToActiveSessions(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
-                                 const Message& message);
+    void completeStop(platform::Turn& turn, const Session& session);
+    void stopAll(platform::Turn& turn, const std::shared_ptr<std::vector<Session>>& sessions);
+    void leave(platform::Turn& turn);
+    void deliver(platform::Turn& turn, Delivery delivery);
+    void beginDelivery(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery);
+    bool deliverToNext(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery);
+    void finishDelivery(platform::Turn& turn, const Delivery& delivery);
+    void deliverToReporter(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery,
+                           std::int64_t reporterID);
+    static void deliverToActiveSession(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                                       const Message& message, const Session& session);
     [[nodiscard]] static std::size_t mostReceivers(const Message& message, std::size_t wanted);
     void countRefusedSession(ledger::Tally& tally);
     void countRefusedReceivers(ledger::Tally& tally, const Message& message, std::size_t receivers);

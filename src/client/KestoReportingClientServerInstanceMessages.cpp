@@ -25,67 +25,122 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
     const std::int32_t sender = caller != nullptr ? caller->processIdentifier() : processIdentifier_;
     const std::uint32_t user = caller != nullptr ? caller->userIdentifier() : userIdentifier_;
     auto processName = KestoReportingUtilityProcessNameForPID(sender);
-    constexpr std::size_t fewReceivers = 16;
-    const bool mayTakeLong = !reporterIDs || reporterIDs->size() > fewReceivers;
-    auto deliver = [message = Message{std::move(message), category, type, sender, user,
-                                      std::move(processName).value_or("(null)"), source_},
-                    reporterIDs = std::move(reporterIDs), reply = std::move(reply)](auto& self, platform::Turn& turn) {
-        KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
-                  reporterIDs ? self.listAllowance_.describe(*reporterIDs) : "(null)");
-        utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
-        const auto delegate = self.delegate_.lock();
-        if (!delegate)
-            return reply(turn, std::nullopt);
-        if (!delegate->isReportingEnabled())
-            return reply(turn, utility::reportingDisabled);
-        if (reporterIDs)
-            self.deliverToReporters(turn, *delegate, message, *reporterIDs);
-        else
-            self.deliverToActiveSessions(turn, *delegate, message);
-        reply(turn, std::nullopt);
+    Delivery delivery{.message = {std::move(message), category, type, sender, user,
+                                  std::move(processName).value_or("(null)"), source_},
+                      .reporterIDs = std::move(reporterIDs),
+                      .reply = std::move(reply)};
+    const bool mayTakeLong = delivery.mayTakeLong();
+    auto work = [delivery = std::move(delivery)](auto& self, platform::Turn& turn) mutable {
+        self.deliver(turn, std::move(delivery));
     };
     if (mayTakeLong)
-        submitLong(std::move(deliver));
+        submitLong(std::move(work));
     else
-        submit(std::move(deliver));
+        submit(std::move(work));
 }
 
-void KestoReportingClientServerInstance::deliverToReporters(platform::Turn& turn,
-                                                            KestoReportingServiceDelegateProtocol& delegate,
-                                                            const Message& message, const ReporterIDs& reporterIDs)
+bool KestoReportingClientServerInstance::Delivery::mayTakeLong() const
 {
-    std::size_t room = mostReceivers(message, reporterIDs.size());
-    std::size_t refused = 0;
-    for (const std::int64_t reporterID : reporterIDs) {
-        const auto session = reporterID == 0 ? nullptr : findReportingSessionForID(reporterID, true);
-        if (!session)
-            continue;
-        if (room == 0) {
-            ++refused;
-            continue;
-        }
-        --room;
-        deliverToSinks(turn, delegate, message, session);
-        deliverToSession(turn, message, session);
+    constexpr std::size_t fewReceivers = 16;
+    return !reporterIDs || reporterIDs->size() > fewReceivers;
+}
+
+void KestoReportingClientServerInstance::deliver(platform::Turn& turn, Delivery delivery)
+{
+    KESTO_LOG(KestoReportingClientCategory(), Debug, "sending message for reporter {}",
+              delivery.reporterIDs ? listAllowance_.describe(*delivery.reporterIDs) : "(null)");
+    utility::emitTraceCode(utility::ServiceTraceCode::ClientSendMessage);
+    const auto delegate = delegate_.lock();
+    if (!delegate)
+        return delivery.reply(turn, std::nullopt);
+    if (!delegate->isReportingEnabled())
+        return delivery.reply(turn, utility::reportingDisabled);
+    beginDelivery(turn, *delegate, delivery);
+    if (!delivery.mayTakeLong()) {
+        while (deliverToNext(turn, *delegate, delivery)) { }
+        return finishDelivery(turn, delivery);
     }
-    countRefusedReceivers(turn.tally, message, refused);
+    const auto shared = std::make_shared<Delivery>(std::move(delivery));
+    inSlices(
+        turn,
+        [shared](auto& self, platform::Turn& now) {
+            const auto service = self.delegate_.lock();
+            return service && self.deliverToNext(now, *service, *shared);
+        },
+        [shared](auto& self, platform::Turn& now) { self.finishDelivery(now, *shared); });
 }
 
-void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn& turn,
-                                                                 KestoReportingServiceDelegateProtocol& delegate,
-                                                                 const Message& message)
+void KestoReportingClientServerInstance::beginDelivery(platform::Turn& turn,
+                                                       KestoReportingServiceDelegateProtocol& delegate,
+                                                       Delivery& delivery)
 {
+    if (delivery.reporterIDs) {
+        delivery.room = mostReceivers(delivery.message, delivery.reporterIDs->size());
+        return;
+    }
     const auto active = delegate.getAllActiveReportingSessions(listAllowance_);
     KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active.size(),
               listAllowance_.describe(active));
-    const std::size_t receivers = std::min(active.size(), mostReceivers(message, active.size()));
-    countRefusedReceivers(turn.tally, message, active.size() - receivers);
-    for (const auto& session : std::span(active).first(receivers)) {
-        deliverToSession(turn, message, session);
-        deliverToSinks(turn, delegate, message, session);
-    }
     if (active.empty())
-        deliverStandalone(turn, delegate, message);
+        return deliverStandalone(turn, delegate, delivery.message);
+    const std::size_t receivers = std::min(active.size(), mostReceivers(delivery.message, active.size()));
+    countRefusedReceivers(turn.tally, delivery.message, active.size() - receivers);
+    const auto receiving = std::span(active).first(receivers);
+    delivery.sessions.assign(receiving.begin(), receiving.end());
+}
+
+// False if none is left.
+bool KestoReportingClientServerInstance::deliverToNext(platform::Turn& turn,
+                                                       KestoReportingServiceDelegateProtocol& delegate,
+                                                       Delivery& delivery)
+{
+    const std::size_t next = delivery.next++;
+    if (delivery.reporterIDs) {
+        if (next == delivery.reporterIDs->size())
+            return false;
+        deliverToReporter(turn, delegate, delivery, (*delivery.reporterIDs)[next]);
+    } else {
+        if (next == delivery.sessions.size())
+            return false;
+        deliverToActiveSession(turn, delegate, delivery.message, delivery.sessions[next].lock());
+    }
+    return true;
+}
+
+void KestoReportingClientServerInstance::finishDelivery(platform::Turn& turn, const Delivery& delivery)
+{
+    countRefusedReceivers(turn.tally, delivery.message, delivery.refused);
+    delivery.reply(turn, std::nullopt);
+}
+
+void KestoReportingClientServerInstance::deliverToReporter(platform::Turn& turn,
+                                                           KestoReportingServiceDelegateProtocol& delegate,
+                                                           Delivery& delivery, std::int64_t reporterID)
+{
+    const auto session = reporterID == 0 ? nullptr : findReportingSessionForID(reporterID, true);
+    if (!session)
+        return;
+    if (delivery.room == 0) {
+        ++delivery.refused;
+        return;
+    }
+    --delivery.room;
+    deliverToSinks(turn, delegate, delivery.message, session);
+    deliverToSession(turn, delivery.message, session);
+}
+
+// The session was started when the delivery began. If it has ended since, it does not get the message.
+void KestoReportingClientServerInstance::deliverToActiveSession(platform::Turn& turn,
+                                                                KestoReportingServiceDelegateProtocol& delegate,
+                                                                const Message& message, const Session& session)
+{
+    if (!session || !session->started()) {
+        turn.tally.add(ledger::Counter::Deliveries);
+        turn.tally.add(ledger::Counter::Inert);
+        return;
+    }
+    deliverToSession(turn, message, session);
+    deliverToSinks(turn, delegate, message, session);
 }
 
 // Without this limit, a message of a million bytes to ten thousand sessions would delay all clients for a minute.

@@ -2,6 +2,7 @@
 #pragma once
 
 #include "client/ListAllowance.h"
+#include "client/SessionEnds.h"
 #include "foundation/values/Value.h"
 #include "session/KestoReportingSession.h"
 
@@ -43,6 +44,8 @@ public:
     // Reports to the session how the drivers' channels changed since the session's snapshot.
     virtual void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session,
                                           const session::DriverMoment& moment) = 0;
+    // What stops the sessions of all clients.
+    [[nodiscard]] virtual std::shared_ptr<client::SessionEnds> sessionEnds() = 0;
     virtual void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) = 0;
     // Offers the message to the bug-capture manager, which exists only on internal builds, with the process that sent
     // it.

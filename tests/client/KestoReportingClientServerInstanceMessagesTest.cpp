@@ -302,6 +302,136 @@ TEST_F(MessagesTest, LetGoOfTheStandaloneSession)
     EXPECT_EQ(platform.traceEmitter.take().back(), sessionDestroyed);
 }
 
+// --- to many sessions
+
+// With each message that a session accepts, a slice of the server queue's time passes.
+class ManyReceiversTest : public MessagesTest {
+protected:
+    static constexpr std::int64_t sessions = 20;
+
+    ManyReceiversTest()
+    {
+        for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID)
+            makeSession(player, reporterID);
+        platform.traceEmitter.setObserver([this](std::uint32_t code) {
+            if (code == sessionMessageAccepted)
+                platform.clock.advance(0.001);
+        });
+    }
+    ~ManyReceiversTest() override { platform.traceEmitter.setObserver(nullptr); }
+
+    [[nodiscard]] static Value allIDs()
+    {
+        std::vector<Value> reporterIDs;
+        for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID)
+            reporterIDs.emplace_back(reporterID);
+        return Array(std::move(reporterIDs));
+    }
+    [[nodiscard]] std::int64_t receivers() const
+    {
+        std::int64_t count = 0;
+        for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID)
+            count += player.session(reporterID) && recorded(player, reporterID) ? 1 : 0;
+        return count;
+    }
+    // Runs until so many sessions have the message.
+    void runUntilReceived(std::int64_t count)
+    {
+        while (receivers() < count)
+            ASSERT_TRUE(platform.workQueues.runOne());
+    }
+};
+
+TEST_F(ManyReceiversTest, LetTheCallsOfOthersGoInBetween)
+{
+    for (const Value& reporterIDs : {Value(), allIDs()}) {
+        const Dictionary message{{reporterIDs.isNull() ? "a" : "b", 1}};
+        const auto sent = player.submit(SendMessage, {message, 4, 1, reporterIDs});
+        const auto behind = player.submit(GetServiceNameForReporterID, {1});
+        const auto other = recorder.submit(GetServiceNameForReporterID, {1});
+        while (recorder.answersTo(other) == unanswered)
+            ASSERT_TRUE(platform.workQueues.runOne());
+        EXPECT_EQ(player.answersTo(sent), unanswered);
+        EXPECT_EQ(player.answersTo(behind), unanswered);
+        platform.workQueues.runAll();
+        EXPECT_EQ(player.answersTo(sent), answeredOnce(delivered));
+        EXPECT_EQ(player.answersTo(behind), answeredOnce({null, 0}));
+        EXPECT_EQ(receivers(), sessions);
+    }
+    EXPECT_EQ(platform.ledger.account()[ledger::Counter::Recorded], 2U * sessions);
+}
+
+TEST_F(ManyReceiversTest, AreReachedTogetherWhileItIsQuick)
+{
+    platform.traceEmitter.setObserver(nullptr);
+    const auto sent = player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    ASSERT_TRUE(platform.workQueues.runOne());
+    EXPECT_EQ(player.answersTo(sent), answeredOnce(delivered));
+}
+
+TEST_F(ManyReceiversTest, DoNotGetAMessageWhenTheyHaveEndedMeanwhile)
+{
+    makeSession(recorder, 101);
+    makeSession(recorder, 102);
+    makeSession(recorder, 103);
+    const auto before = platform.ledger.account();
+    platform.analytics.clear();
+    player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    recorder.submit(StopReportingSessionForID, {101});
+    recorder.submit(DestroyReportingSession, {102});
+    recorder.submit(CreateReportingSession, {103}); // in place of the one before
+    platform.workQueues.runAll();
+    const auto after = platform.ledger.account();
+    EXPECT_EQ(receivers(), sessions);
+    EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Playback.Start"), SizeIs(sessions));
+    EXPECT_EQ(after[ledger::Counter::Deliveries] - before[ledger::Counter::Deliveries], sessions + 3U);
+    EXPECT_EQ(after[ledger::Counter::Inert] - before[ledger::Counter::Inert], 3U);
+}
+
+TEST_F(ManyReceiversTest, GetAMessageOnceWhenTheyBeginAgainMeanwhile)
+{
+    makeSession(recorder, 101);
+    player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    recorder.submit(StopReportingSessionForID, {101});
+    recorder.submit(StartReportingSessionForID, {101});
+    platform.workQueues.runAll();
+    EXPECT_EQ(recorded(recorder, 101)->find("a")->text(), "1");
+    EXPECT_EQ(recorder.session(101)->messageIdentifierCounts(), (Dictionary{{"Playback_Start", 1}}));
+}
+
+TEST_F(ManyReceiversTest, AreNotThoseThatStartMeanwhile)
+{
+    makeSession(recorder, 101, false);
+    player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    ASSERT_TRUE(platform.workQueues.runOne());
+    recorder.submit(StartReportingSessionForID, {101});
+    platform.workQueues.runAll();
+    EXPECT_EQ(receivers(), sessions);
+    EXPECT_EQ(recorded(recorder, 101), std::nullopt);
+}
+
+TEST_F(ManyReceiversTest, AreNotReachedAnyMoreWhenTheServiceObjectHasGone)
+{
+    const auto sent = player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    runUntilReceived(3);
+    const auto keptAlive = player.object();
+    std::vector<std::shared_ptr<KestoReportingSession>> kept;
+    for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID)
+        kept.push_back(player.session(reporterID));
+    harness.service.reset();
+    platform.workQueues.runAll();
+    EXPECT_EQ(player.answersTo(sent), answeredOnce(delivered));
+    EXPECT_EQ(receivers(), 3);
+}
+
+TEST_F(ManyReceiversTest, AreAllReachedBeforeTheirLostClientGoes)
+{
+    player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    player.close();
+    EXPECT_EQ(player.object(), nullptr);
+    EXPECT_EQ(platform.ledger.account()[ledger::Counter::Recorded], 2U * sessions) << "the message and the summaries";
+}
+
 // --- order
 
 // One journal of the session, the analytics bridge and the bug-capture manager.
@@ -367,6 +497,7 @@ public:
     MOCK_METHOD(void, sendDriverLogsForSession,
                 (platform::Turn&, const std::shared_ptr<KestoReportingSession>&, const session::DriverMoment&),
                 (override));
+    MOCK_METHOD(std::shared_ptr<client::SessionEnds>, sessionEnds, (), (override));
     MOCK_METHOD(void, removeClient, (const std::shared_ptr<KestoReportingClientServerInstance>&), (override));
     MOCK_METHOD(void, handleEventForVorp,
                 (const Dictionary&, AudioEventCategory, std::uint16_t, const std::shared_ptr<KestoReportingSession>&,
@@ -456,6 +587,7 @@ TEST_F(ClientAndServiceTest, HandsTheMessageItsSessionAndTheSendersNameToTheBugC
 TEST_F(ClientAndServiceTest, TellsWhichProcessSentTheMessageWhileTheBugCaptureManagerHasIt)
 {
     createSession(42);
+    support::onServerQueue(platform.workQueues, [&] { session(42)->start(); });
     const FakeConnection callers(18);
     const auto sendFromBoth = [&](const auto& reporterIDs) {
         {

@@ -752,6 +752,41 @@ TEST_F(ClientServerInstanceTest, ListsTheReportersOfAllClientsInOrder)
     EXPECT_THAT(platform.traceEmitter.take(), IsEmpty());
 }
 
+TEST_F(ClientServerInstanceTest, ListsManyReportersInSlices)
+{
+    create(42);
+    recorder.call(CreateReportingSession, 43);
+    platform.clock.setPaceOfSystemUptime(0.001);
+    const auto listed = player.submit(GetAllReporters, {});
+    const auto other = recorder.submit(CreateReportingSession, {44});
+    ASSERT_TRUE(platform.workQueues.runOne());
+    EXPECT_EQ(player.answersTo(listed), unanswered);
+    ASSERT_TRUE(platform.workQueues.runOne());
+    EXPECT_EQ(recorder.answersTo(other), answeredOnce(succeeded));
+    platform.workQueues.runAll();
+    EXPECT_EQ(player.answersTo(listed), answeredOnce({null, Array{42, 43, 44}}));
+}
+
+TEST_F(ClientServerInstanceTest, ListsReportersAtOnceWhileItIsQuick)
+{
+    create(42);
+    const auto listed = player.submit(GetAllReporters, {});
+    ASSERT_TRUE(platform.workQueues.runOne());
+    EXPECT_EQ(player.answersTo(listed), answeredOnce({null, Array{42}}));
+}
+
+TEST_F(ClientServerInstanceTest, MakesNoFurtherListForAClientThatGoesMeanwhile)
+{
+    create(42);
+    platform.clock.setPaceOfSystemUptime(0.001);
+    const auto listed = player.submit(GetAllReporters, {});
+    ASSERT_TRUE(platform.workQueues.runOne());
+    player.object()->handleConnectionError();
+    platform.workQueues.runAll();
+    EXPECT_EQ(player.answersTo(listed), unanswered);
+    EXPECT_EQ(player.connection().unansweredCalls(), 0U);
+}
+
 TEST_F(ClientServerInstanceTest, ListsNothingForAClientThatHasGone)
 {
     create(42);

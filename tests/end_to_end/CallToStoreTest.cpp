@@ -1,5 +1,6 @@
 // The whole path, from a client's call to a stored event, through a real service.
 #include "end_to_end/Kestod.h"
+#include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
 #include "support/MessageKinds.h"
 
@@ -19,6 +20,7 @@ using support::typeStart;
 using testing::ElementsAre;
 using testing::Field;
 using testing::HasSubstr;
+using testing::IsEmpty;
 using testing::MatchesRegex;
 using testing::SizeIs;
 
@@ -411,6 +413,37 @@ TEST(InternalRoadTest, PlayingBecomesAVolumeEventAndASummaryFile)
         EXPECT_THAT(support::readFile(file.path()), HasSubstr("Volume_Summary_1"));
     }
     EXPECT_EQ(files, 1U);
+}
+
+// The end of this session takes many times as long as a call.
+TEST(InternalRoadTest, ALongStopHoldsUpItsClientAndNoOther)
+{
+    constexpr int changes = 20'000;
+    constexpr int session = 1;
+    Kestod kestod(Kestod::Files{{"device.toml", "InternalBuild = true\n"}});
+    kestod.start();
+    WireClient player(kestod.socketPath());
+    WireClient other(kestod.socketPath());
+    player.ask(Create, session);
+    const auto started = player.call(Start, session);
+    for (int change = 0; change <= changes; ++change)
+        player.ask(SendMessage,
+                   Dictionary{{"session_output_running", true},
+                              {"PomoSessionVolume", change % 2},
+                              {"kestoreporting_timestamp", change}},
+                   playback, typeStart, Array{session});
+    const auto stopped = player.call(Stop, session);
+    const auto destroyed = player.call(Destroy, session);
+    ASSERT_TRUE(kestod.waitForLog("sending volume event for reporter 1"));
+    for (int call = 0; call < 3; ++call)
+        other.ask(SendMessage, Dictionary{{"a", call}}, playback, typeStart, null);
+    EXPECT_EQ(kestod.countInLog("stopping 1"), 0U) << "the others were answered before it was over";
+    EXPECT_EQ(kestod.countInLog("active reporting sessions 0 : []"), 3U) << "for them it was stopped";
+    player.replyTo(started);
+    player.replyTo(stopped);
+    player.replyTo(destroyed);
+    EXPECT_THAT(kestod.events("com.quarn.kesto.Volume.Summary"), SizeIs(changes));
+    EXPECT_THAT(brokenSums(kestod), IsEmpty());
 }
 
 TEST(InternalRoadTest, AFolderForDiagnosticFilesThatWentIsMadeAgain)

@@ -113,6 +113,33 @@ TEST_P(EndBySignalTest, StartedSessionsStopAndTheirClientsGetTheirUptime)
     EXPECT_TRUE(first.isClosed()) << "without an answer to the starts";
 }
 
+// A session whose end takes long: one of the client that waits for its stop, and one of a client that is still there.
+TEST_P(EndBySignalTest, LongSessionsAreReportedInFull)
+{
+    constexpr int changes = 5000;
+    Kestod kestod(internalBuild);
+    kestod.start();
+    WireClient stopping(kestod.socketPath());
+    WireClient playing(kestod.socketPath());
+    for (auto* client : {&stopping, &playing}) {
+        const int session = client == &stopping ? 1 : 2;
+        client->ask(Create, session);
+        client->call(Start, session);
+        for (int change = 0; change <= changes; ++change)
+            client->ask(SendMessage,
+                        Dictionary{{"session_output_running", true},
+                                   {"PomoSessionVolume", change % 2},
+                                   {"kestoreporting_timestamp", change}},
+                        playback, typeStart, Array{session});
+    }
+    stopping.call(Stop, 1);
+    endBy(kestod, GetParam());
+    EXPECT_THAT(kestod.events(volumeEvents), SizeIs(2 * changes));
+    EXPECT_THAT(kestod.events(uptimeEvents), SizeIs(2));
+    EXPECT_EQ(kestod.countInLog("given up"), 0U);
+    EXPECT_THAT(brokenSums(kestod), testing::IsEmpty());
+}
+
 TEST(EndTest, AThousandClientsGetTheirUptimeAndTheirSessionsStop)
 {
     constexpr int count = 1000;

@@ -16,13 +16,16 @@ public:
         secondsSince1970_ += seconds;
         systemUptime_ += seconds;
     }
+    // Lets so much uptime pass whenever it is asked for.
+    void setPaceOfSystemUptime(double seconds) { pace_ = seconds; }
 
     [[nodiscard]] double secondsSince1970() const override { return secondsSince1970_; }
-    [[nodiscard]] double systemUptime() const override { return systemUptime_; }
+    [[nodiscard]] double systemUptime() const override { return systemUptime_ += pace_; }
 
 private:
     double secondsSince1970_ = 1'000'000'000;
-    double systemUptime_ = 5000;
+    mutable double systemUptime_ = 5000;
+    double pace_ = 0;
 };
 
 } // namespace support

@@ -64,7 +64,9 @@ public:
         isPausing_ = true;
         return [self = shared_from_this()](platform::TurnItem item) {
             self->isPausing_ = false;
-            self->queues_.items_.push_front({self->queue_, self, std::move(item)});
+            auto& items = self->queues_.items_;
+            const auto held = std::ranges::stable_partition(items, [&](const Item& each) { return each.lane != self; });
+            items.insert(held.begin(), {self->queue_, self, std::move(item)}); // the others' turn comes first
         };
     }
 
