@@ -114,7 +114,8 @@ constexpr std::array<CounterRow, counterCount> makeRows()
          "let the trace's parameters name fewer points"},
         {TracePointsLost, "traces.lostPoints", Loss, "a trace's parameters named too many traces and points",
          "let the trace's parameters name fewer points"},
-        {LogLinesLost, "log.lostLines", Limit, "the journal or the disk did not take them in time", "let the service log less"},
+        {LogLinesLost, "log.lostLines", Limit, "the journal or the disk did not take them in time",
+         "let the service log less"},
         {WorkLostToEnd, "work.lost.end", Loss, "the service had no time left for background work when it ended",
          "look for a disk that is slow or hangs"},
     }};
