@@ -68,8 +68,9 @@ private:
         {
             return std::make_shared<ImmediateQueue>();
         }
-        [[nodiscard]] bool isFull() override { return false; }
+        [[nodiscard]] bool isFull(std::size_t) override { return false; }
         void setRoomHandler(std::function<void()>) override { }
+        void setReleaseHandler(std::function<void(std::size_t)>) override { }
         [[nodiscard]] Resume pause() override
         {
             return [this](platform::TurnItem item) { submit(std::move(item)); };

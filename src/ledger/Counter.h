@@ -55,6 +55,7 @@ enum class Counter : std::uint8_t {
     ConnectionsInterrupted,
     AcceptingPauses,
     ReadingPauses,
+    MemoryPauses, // of reading, because all connections together hold too much
     AnswerBytesDropped,
     FramesTooLong,
     FramesNotCbor,

@@ -19,6 +19,7 @@
 #include "platform/Turn.h"
 
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <functional>
 #include <memory>
@@ -66,11 +67,14 @@ public:
 // What is submitted to the queue itself is a lane, too, of a user of its own. Items of different lanes have no order.
 class Lane : public TurnQueue {
 public:
-    // Whether so many items wait that the submitter should pause. After it returned true, the handler is called once
-    // when few are left.
-    [[nodiscard]] virtual bool isFull() = 0;
-    // The thread that runs the items calls the handler. Set it before `isFull` is called.
+    // Whether so many items wait that the submitter should pause. After it returned true, the room handler is called
+    // once when few are left. What was submitted since the last call holds so many bytes: the release handler gets them
+    // once, when all of it has run.
+    [[nodiscard]] virtual bool isFull(std::size_t heldBytes) = 0;
+    // The thread that runs the items calls the handlers; the release handler also the one that calls `isFull`, and
+    // under the queue's lock, so that it must not use the queue. Set both before `isFull` is called.
     virtual void setRoomHandler(std::function<void()> handler) = 0;
+    virtual void setReleaseHandler(std::function<void(std::size_t bytes)> handler) = 0;
 
     // Continues a lane that pauses: its next item is this one, as by `submitLong`. Any thread.
     using Resume = std::move_only_function<void(TurnItem item)>;

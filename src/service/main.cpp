@@ -86,6 +86,7 @@ int run()
     platform::install(platform.platform());
     platform.removeUnfinished(KestoReportingTracingLogsDirectory());
     (*listener)->setEmitterAccess(platform.emitterAccess());
+    (*listener)->setMemory(platform.platform().memory);
     const auto service = KestoReportingServiceDelegate::make();
     (*listener)->setDelegate(*service);
     const ledger::ServiceProcess process{.version = KESTO_VERSION,

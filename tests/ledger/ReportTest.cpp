@@ -78,7 +78,7 @@ TEST(Report, HasCountsWithinGroupsAlsoWhenTheyAre0)
     EXPECT_EQ(at(whole, "sinceStart.refused.memory"), Value(0));
     EXPECT_EQ(at(whole, "connections").text(),
               R"({"accepted":0,"refused":{"userLimit":0},"ended":0,"interrupted":0,"acceptingPauses":0,)"
-              R"("readingPauses":0,"answerBytesDropped":0})");
+              R"("readingPauses":0,"memoryPauses":0,"answerBytesDropped":0})");
 }
 
 TEST(Report, SaysWhichProcessCountsAndSinceWhen)

@@ -218,8 +218,24 @@ TEST_P(WorkQueuesContract, ALaneWithFewItemsIsNotFull)
     const auto lane = queue->makeLane(1000);
     lane->setRoomHandler([] { ADD_FAILURE() << "it was never full"; });
     lane->submit(noting("a"));
-    EXPECT_FALSE(lane->isFull());
+    EXPECT_FALSE(lane->isFull(0));
     waitForNotes(1);
+}
+
+TEST_P(WorkQueuesContract, ALaneReleasesWhatItsItemsHoldWhenAllOfThemHaveRun)
+{
+    const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
+    const auto lane = queue->makeLane(1000);
+    std::atomic<std::size_t> released = 0;
+    lane->setReleaseHandler([&](std::size_t bytes) {
+        released = bytes;
+        note("released");
+    });
+    lane->submit(noting("a"));
+    lane->submit([&] { note(released == 0 ? "b" : "b, after the release"); });
+    static_cast<void>(lane->isFull(700));
+    EXPECT_THAT(waitForNotes(3), ElementsAre("a", "b", "released"));
+    EXPECT_EQ(released, 700U);
 }
 
 TEST_P(WorkQueuesContract, AQueueIsCurrentWhileItRunsAnItemAndNowhereElse)

@@ -57,8 +57,17 @@ public:
     }
     [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user) override { return queue_->makeLane(user); }
     [[nodiscard]] bool isCurrent() const override { return queue_->isCurrent(); }
-    [[nodiscard]] bool isFull() override { return false; }
+    [[nodiscard]] bool isFull(std::size_t heldBytes) override
+    {
+        if (heldBytes != 0)
+            submit([this, heldBytes](platform::Turn&) { releaseHandler_(heldBytes); });
+        return false;
+    }
     void setRoomHandler(std::function<void()>) override { }
+    void setReleaseHandler(std::function<void(std::size_t bytes)> handler) override
+    {
+        releaseHandler_ = std::move(handler);
+    }
     [[nodiscard]] Resume pause() override
     {
         isPausing_ = true;
@@ -75,6 +84,7 @@ public:
 private:
     FakeWorkQueues& queues_;
     const std::shared_ptr<Queue> queue_;
+    std::function<void(std::size_t bytes)> releaseHandler_ = [](std::size_t) { };
     bool isPausing_ = false;
 };
 

@@ -34,6 +34,8 @@ public:
     [[nodiscard]] std::expected<std::optional<Frame>, Refusal> next();
     // Whether only a part of a frame has come.
     [[nodiscard]] bool isInsideFrame() const { return reader_.isInsideFrame(); }
+    // The memory of that part.
+    [[nodiscard]] std::size_t heldBytes() const { return reader_.heldBytes(); }
 
 private:
     FrameReader reader_;

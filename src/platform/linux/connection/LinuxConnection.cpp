@@ -66,6 +66,7 @@ private:
 LinuxConnection::LinuxConnection(std::shared_ptr<ConnectionHub> hub, FileDescriptor socket, Peer peer)
     : hub_(std::move(hub)),
       peer_(peer),
+      share_(hub_->transit.makeShare(peer.userIdentifier)),
       socket_(std::move(socket))
 {
 }
@@ -85,6 +86,7 @@ void LinuxConnection::setLane(std::shared_ptr<Lane> lane)
             self->watch();
         }
     });
+    lane_->setReleaseHandler([hub = hub_, share = share_](std::size_t bytes) { hub->transit.remove(*share, bytes); });
 }
 
 void LinuxConnection::resume()
@@ -115,9 +117,20 @@ LinuxConnection::Next LinuxConnection::handle(std::uint32_t events, std::size_t 
         reads = wantsToRead();
     }
     if (reads)
-        read(mostBytes);
+        readIfThereIsRoom(mostBytes);
     answerStatusRequest();
     return settle();
+}
+
+// What is not read stays in the socket.
+void LinuxConnection::readIfThereIsRoom(std::size_t mostBytes)
+{
+    const std::size_t room = hub_->transit.roomFor(*share_, partBytes_);
+    const bool lackedRoom = std::exchange(lacksRoom_, room == 0);
+    if (!lacksRoom_)
+        read(std::min(mostBytes, room));
+    else if (!lackedRoom)
+        hub_->ledger.count(Counter::MemoryPauses);
 }
 
 // It also reads from a client that is behind but gone: the bytes left in the socket are limited, and only behind them
@@ -139,7 +152,9 @@ LinuxConnection::Next LinuxConnection::settle()
         if (!breakReason_ && !peerIsDone_) {
             watch();
             const bool answers = !statusRequests_.empty() && output_.empty();
-            return wantsToRead() || answers ? Next::Turn : Next::Event;
+            if (answers || (wantsToRead() && !lacksRoom_))
+                return Next::Turn;
+            return wantsToRead() ? Next::Room : Next::Event;
         }
         reason = breakReason_; // it counts even if the peer closed at the same moment
     }
@@ -168,6 +183,7 @@ void LinuxConnection::finish()
 {
     assert(hub_->isConnectionThread());
     isFinishing_ = true;
+    lacksRoom_ = false;
     ::shutdown(socket_.get(), SHUT_RD);
     while (settle() != Next::End)
         read(ConnectionHub::mostReadAtOnce);
@@ -189,6 +205,7 @@ void LinuxConnection::takeIn(std::string_view bytes)
 {
     input_.feed(bytes);
     const auto decoded = decodeFrames();
+    countPart();
     const auto delivered = deliverCalls();
     if (!delivered)
         breakOff(delivered.error().reason);
@@ -222,8 +239,23 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
     }
 }
 
+void LinuxConnection::countPart()
+{
+    const std::size_t before = std::exchange(partBytes_, input_.isInsideFrame() ? input_.heldBytes() : 0);
+    if (partBytes_ > before)
+        hub_->transit.add(*share_, partBytes_ - before);
+    else if (partBytes_ < before)
+        hub_->transit.remove(*share_, before - partBytes_);
+    if (partBytes_ == 0)
+        hub_->transit.completed(*share_);
+}
+
 std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
 {
+    std::size_t held = 0;
+    for (const Call& call : hub_->calls)
+        held += foundation::Value(call.frame).roughBytes();
+    hub_->transit.add(*share_, held);
     const CallScope scope(*this);
     std::expected<void, Violation> result;
     for (Call& call : hub_->calls) {
@@ -234,8 +266,10 @@ std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
     hub_->calls.clear();
     if (lane_ != nullptr) {
         isLaneFull_ = true; // before the question, because the lane may have room again at once
-        if (!lane_->isFull())
+        if (!lane_->isFull(held))
             isLaneFull_ = false;
+    } else {
+        hub_->transit.remove(*share_, held);
     }
     if (!result)
         hub_->ledger.count(Counter::FramesNotACall);
@@ -281,6 +315,7 @@ std::expected<void, Connection::Violation> LinuxConnection::askForStatus(const f
         return std::unexpected(wrongNumber);
     hub_->ledger.count(Counter::CallsStatus);
     unanswered_.fetch_add(unansweredCall(size));
+    hub_->transit.add(*share_, sizeof(StatusRequest));
     awaitsStatus_ = true;
     const foundation::Lock lock(lock_);
     statusRequests_.push_back({*number, size});
@@ -311,6 +346,7 @@ void LinuxConnection::answerStatusRequest()
         const foundation::Lock lock(lock_);
         startOutput(frame, nullptr);
     }
+    hub_->transit.remove(*share_, sizeof(StatusRequest));
     returnCredit(request.size);
 }
 
@@ -328,6 +364,7 @@ void LinuxConnection::startOutput(std::string_view frame, const EmitterDescripto
     std::string whole;
     appendFrame(frame, whole);
     unsentBytes_ += whole.size();
+    hub_->transit.add(*share_, whole.size());
     if (descriptors != nullptr)
         output_.append(std::move(whole), *descriptors);
     else
@@ -348,6 +385,10 @@ void LinuxConnection::send(Turn& turn, std::string frame)
 {
     const std::size_t size = frameHeadSize + frame.size();
     const std::size_t unsent = unsentBytes_.fetch_add(size) + size;
+    if (!hasGivenUp_ && hub_->transit.add(*share_, size))
+        makeRoom();
+    if (hasGivenUp_)
+        return drop(size);
     if (frame.size() > longestFrame)
         breakOff("an answer is longer than a frame may be");
     else if (unsent > mostUnsentBytes)
@@ -377,7 +418,7 @@ void LinuxConnection::writeOutput()
     if (isOver_ || output_.empty())
         return;
     if (const auto taken = output_.writeTo(socket_.get())) {
-        unsentBytes_ -= *taken;
+        noLongerUnsent(*taken);
     } else { // reading goes on, because earlier bytes of the peer are still there
         cannotSend_ = true;
         drop(output_.drop());
@@ -389,9 +430,55 @@ void LinuxConnection::drop(std::size_t bytes)
 {
     if (bytes == 0)
         return;
-    unsentBytes_ -= bytes;
+    noLongerUnsent(bytes);
     droppedBytes_ += bytes;
     hub_->ledger.count(Counter::AnswerBytesDropped, bytes);
+}
+
+void LinuxConnection::noLongerUnsent(std::size_t bytes)
+{
+    unsentBytes_ -= bytes;
+    if (!hasGivenUp_)
+        hub_->transit.remove(*share_, bytes);
+}
+
+// The connection that leaves the most answers unread, of one user or of all, or null. Those that have given up free
+// their memory soon.
+std::shared_ptr<LinuxConnection> LinuxConnection::largestDebtor(ConnectionHub& hub, const TransitMemory::User* of)
+{
+    std::shared_ptr<LinuxConnection> largest;
+    const foundation::Lock lock(hub.connectionsLock);
+    for (const auto& [identity, weak] : hub.connections) {
+        const auto each = weak.lock();
+        const bool isCandidate = each && !each->hasGivenUp_ && (of == nullptr || each->share_->user.get() == of);
+        if (isCandidate && each->unsentBytes_ > (largest ? largest->unsentBytes_.load() : 0))
+            largest = each;
+    }
+    return largest;
+}
+
+// Ends connections until the limits hold. Only the thread that runs the turn adds answers and makes room.
+void LinuxConnection::makeRoom()
+{
+    using enum TransitMemory::Excess;
+    for (auto excess = hub_->transit.excess(*share_); excess != None; excess = hub_->transit.excess(*share_)) {
+        const auto debtor = excess == OfTheClient
+            ? shared_from_this()
+            : largestDebtor(*hub_, excess == OfTheUser ? share_->user.get() : hub_->transit.largestUser().get());
+        if (!debtor || debtor->hasGivenUp_)
+            return;
+        debtor->giveUp();
+    }
+}
+
+// Its answers will be dropped, and count no longer.
+void LinuxConnection::giveUp()
+{
+    const foundation::Lock lock(lock_);
+    hub_->transit.remove(*share_, unsentBytes_);
+    hasGivenUp_ = true;
+    breakOffLocked("it does not read its answers, and memory is short");
+    drop(output_.drop());
 }
 
 bool LinuxConnection::isBehind() const noexcept
@@ -427,6 +514,11 @@ void LinuxConnection::watch()
 void LinuxConnection::breakOff(std::string reason)
 {
     const foundation::Lock lock(lock_);
+    breakOffLocked(std::move(reason));
+}
+
+void LinuxConnection::breakOffLocked(std::string reason)
+{
     if (isOver_ || breakReason_)
         return;
     breakReason_ = std::move(reason);
@@ -442,12 +534,19 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
         if (isOver_)
             return;
         isOver_ = true;
+        hub_->transit.remove(*share_, statusRequests_.size() * sizeof(StatusRequest));
         statusRequests_.clear();
         drop(output_.drop());
         readingPauses = readingPauses_;
         if (isResumed_) // closing is not enough while a child process holds a copy
             ::epoll_ctl(hub_->epoll.get(), EPOLL_CTL_DEL, socket_.get(), nullptr);
         socket_ = FileDescriptor();
+    }
+    hub_->transit.remove(*share_, std::exchange(partBytes_, 0));
+    hub_->transit.completed(*share_);
+    {
+        const foundation::Lock lock(hub_->connectionsLock);
+        hub_->connections.erase(this);
     }
     if (hasAskedForEmitterAccess_ && hub_->emitterAccess != nullptr)
         hub_->emitterAccess->forget(this);

@@ -8,7 +8,7 @@
 // thread, and only when the socket has taken the one before. The other requests wait; they count as unanswered calls.
 //
 // A connection reads only while its lane has room, so that calls that cannot be carried out soon stay with their
-// client.
+// client; and only while there is memory for what comes (see TransitMemory).
 //
 // Every client is treated as hostile. If one breaks the protocol, its own connection ends, with one line in the log. If
 // it asks faster than it gets answers, or does not read its answers, the connection stops reading from it until it is
@@ -69,12 +69,15 @@ public:
     // What a connection waits for.
     enum class Next : std::uint8_t {
         Event, // of its socket
+        Room, // in the memory of all connections
         Turn, // of the connection thread: it has more to do already
         End // nothing: it is over, so that the listener forgets it
     };
     // Handles events of the socket (those of epoll, once for each change), and what earlier calls left to do. Reads at
     // most so many bytes. Connection thread.
     [[nodiscard]] Next handle(std::uint32_t events, std::size_t mostBytes);
+    // Whether there may be memory for what it did not read. Connection thread.
+    [[nodiscard]] bool mayHaveRoom() { return hub_->transit.mayHaveRoom(*share_, partBytes_); }
 
     // Ends the connection, with its handlers. Connection thread.
     void invalidate() { end(std::nullopt); }
@@ -91,6 +94,7 @@ private:
 
     [[nodiscard]] bool wantsToRead() const KESTO_REQUIRES(lock_);
     [[nodiscard]] Next settle();
+    void readIfThereIsRoom(std::size_t mostBytes);
     void read(std::size_t mostBytes);
     void endOfStream();
     void takeIn(std::string_view bytes);
@@ -101,13 +105,20 @@ private:
     [[nodiscard]] std::expected<void, Violation> askForStatus(const foundation::Value& call, std::size_t size);
     void answerStatusRequest();
     [[nodiscard]] bool mayKnowWhatOthersDid() const;
+    void countPart();
+    [[nodiscard]] static std::shared_ptr<LinuxConnection> largestDebtor(ConnectionHub& hub,
+                                                                        const TransitMemory::User* of);
+    void makeRoom();
+    void giveUp();
     void breakOff(std::string reason);
+    void breakOffLocked(std::string reason) KESTO_REQUIRES(lock_);
     void end(std::optional<std::string> interruptedBecause);
 
     void startOutput(std::string_view frame, const EmitterDescriptors* descriptors) KESTO_REQUIRES(lock_);
     void returnCredit(std::size_t bytes);
     [[nodiscard]] bool isBehind() const noexcept;
     void drop(std::size_t bytes);
+    void noLongerUnsent(std::size_t bytes);
     void writeOutput() KESTO_REQUIRES(lock_);
     void watch() KESTO_REQUIRES(lock_);
 
@@ -120,12 +131,17 @@ private:
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;
     ConnectionInput input_;
+    std::size_t partBytes_ = 0; // memory of a frame that has come in part
     bool mayHaveUnread_ = false; // bytes in the socket
+    bool lacksRoom_ = false; // for what is in the socket
     bool peerIsGone_ = false; // it sends no more, or cannot be reached
     bool peerIsDone_ = false; // all that it sent is read, and ends between two frames
     bool isFinishing_ = false; // by the service: a frame that is cut short is not the peer's fault
     bool hasAskedForEmitterAccess_ = false;
     bool awaitsStatus_ = false; // a request waits, so that other connections need no lock to find none
+
+    const std::shared_ptr<TransitMemory::Share> share_; // of the part, of waiting calls and requests, and of answers
+    std::atomic<bool> hasGivenUp_ = false; // its answers, which count no longer
 
     // How far the client is behind.
     std::atomic<bool> isLaneFull_ = false; // this alone is not the client's fault, so no pause is counted

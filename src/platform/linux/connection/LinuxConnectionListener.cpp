@@ -49,7 +49,7 @@ LinuxConnectionListener::create(ListeningSocket socket, ledger::Ledger& ledger, 
         return std::unexpected(systemError());
     std::unique_ptr<LinuxConnectionListener> listener(
         new LinuxConnectionListener(std::move(socket), std::move(epoll), std::move(wake), ledger, log));
-    if (!listener->watch(EPOLL_CTL_ADD, listener->wake_.get(), EPOLLIN | EPOLLET, &listener->wake_)
+    if (!listener->watch(EPOLL_CTL_ADD, listener->hub_->wake.get(), EPOLLIN | EPOLLET, &listener->hub_->wake)
         || !listener->watch(EPOLL_CTL_ADD, listener->socket_.descriptor(), 0, &listener->socket_))
         return std::unexpected(systemError());
     return listener;
@@ -58,8 +58,7 @@ LinuxConnectionListener::create(ListeningSocket socket, ledger::Ledger& ledger, 
 LinuxConnectionListener::LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake,
                                                  ledger::Ledger& ledger, LogCategory& log)
     : socket_(std::move(socket)),
-      wake_(std::move(wake)),
-      hub_(std::make_shared<ConnectionHub>(std::move(epoll), log, ledger)),
+      hub_(std::make_shared<ConnectionHub>(std::move(epoll), std::move(wake), log, ledger)),
       mostConnections_(mostConnections()),
       mostConnectionsOfAUser_(mostConnections_ - mostConnections_ / partForOthers)
 {
@@ -91,7 +90,7 @@ void LinuxConnectionListener::resume()
 void LinuxConnectionListener::serve()
 {
     SerialQueue::Helper helper;
-    ThreadHeap heap([this] { wake(); });
+    ThreadHeap heap([this] { hub_->wakeUp(); });
     while (!isStopping_) {
         std::array<epoll_event, mostEventsAtOnce> events;
         const int count =
@@ -100,6 +99,7 @@ void LinuxConnectionListener::serve()
             handle(events[static_cast<std::size_t>(index)]);
         if (acceptAgainAt_ && *acceptAgainAt_ <= Clock::now())
             resumeAccepting();
+        lookForRoom();
         serveReaders();
         helper.help();
         heap.tidyIfAsked();
@@ -109,20 +109,17 @@ void LinuxConnectionListener::serve()
 void LinuxConnectionListener::stop()
 {
     isStopping_ = true;
-    wake();
-}
-
-void LinuxConnectionListener::wake()
-{
-    ::eventfd_write(wake_.get(), 1);
+    hub_->wakeUp();
 }
 
 // In milliseconds, as epoll counts; rounded up, so that the loop does not wake too early.
 int LinuxConnectionListener::waitingTime() const
 {
-    if (!acceptAgainAt_)
+    const auto end = std::min(acceptAgainAt_.value_or(Clock::time_point::max()),
+                              waitingForRoom_.empty() ? Clock::time_point::max() : lookForRoomAt_);
+    if (end == Clock::time_point::max())
         return -1;
-    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*acceptAgainAt_ - Clock::now());
+    const auto left = std::chrono::ceil<std::chrono::milliseconds>(end - Clock::now());
     return static_cast<int>(std::max<std::chrono::milliseconds::rep>(left.count(), 0));
 }
 
@@ -131,11 +128,30 @@ void LinuxConnectionListener::handle(const epoll_event& event)
     const void* const tag = event.data.ptr; // a copy, because the kernel packs its structure
     if (tag == &socket_) {
         acceptWaiting();
-    } else if (tag != &wake_) { // `wake_` itself needs no handling
+    } else if (tag == &hub_->wake) {
+        lookForRoomAt_ = {};
+    } else {
         const auto& reader = connections_.at(tag);
         reader->events |= event.events;
         ready_.enter(reader);
     }
+}
+
+// Usually the memory says when it has room; a limit that was raised is found by looking.
+void LinuxConnectionListener::lookForRoom()
+{
+    if (waitingForRoom_.empty())
+        return;
+    const auto now = Clock::now();
+    if (now < lookForRoomAt_)
+        return;
+    lookForRoomAt_ = now + lookingPause;
+    std::erase_if(waitingForRoom_, [this](const auto& reader) {
+        const bool mayHaveRoom = reader->connection->mayHaveRoom();
+        if (mayHaveRoom)
+            ready_.enter(reader);
+        return mayHaveRoom;
+    });
 }
 
 // Those that want little are all served at once.
@@ -164,7 +180,9 @@ bool LinuxConnectionListener::serve(Reader& reader, std::size_t mostBytes)
 {
     using enum LinuxConnection::Next;
     const auto next = reader.connection->handle(std::exchange(reader.events, 0), mostBytes);
-    if (next == End) {
+    if (next == Room) {
+        waitingForRoom_.insert(connections_.at(reader.connection.get()));
+    } else if (next == End) {
         forget(*reader.connection);
         if (!isAccepting_)
             resumeAccepting();
@@ -210,6 +228,10 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     reader->connection = connection;
     ready_.admit(*reader, peer.uid);
     connections_.emplace(connection.get(), reader);
+    {
+        const foundation::Lock lock(hub_->connectionsLock);
+        hub_->connections.emplace(connection.get(), connection);
+    }
     hub_->ledger.count(ledger::Counter::ConnectionsAccepted);
     if (!delegate_->shouldAcceptNewConnection(*this, connection))
         connection->invalidate();
@@ -222,7 +244,9 @@ void LinuxConnectionListener::forget(const LinuxConnection& connection)
     user->second.refusalIsLogged = false;
     if (--user->second.connections == 0)
         users_.erase(user);
-    connections_.erase(&connection);
+    const auto known = connections_.find(&connection);
+    waitingForRoom_.erase(known->second);
+    connections_.erase(known);
 }
 
 // Without descriptors the waiting clients must wait: trying again without a pause would only keep the thread busy.

@@ -28,6 +28,7 @@
 #include <optional>
 #include <system_error>
 #include <unordered_map>
+#include <unordered_set>
 
 struct epoll_event;
 
@@ -42,6 +43,8 @@ public:
     static constexpr std::size_t partForOthers = 4;
     // How long clients wait if the system has no descriptor for them.
     static constexpr std::chrono::milliseconds acceptingPause{1000};
+    // How long connections that wait for memory wait at most before they look for it themselves.
+    static constexpr std::chrono::milliseconds lookingPause{1000};
 
     // The ledger counts the connections, and the category gets a line for each that breaks. Fails if the system has no
     // descriptors left.
@@ -56,6 +59,12 @@ public:
     void setStatus(std::function<foundation::Dictionary(bool withCulprits)> status)
     {
         hub_->status = std::move(status);
+    }
+    // Bounds what all connections together hold (see TransitMemory). Without this there are no such bounds. Call this
+    // before `resume`.
+    void setMemory(const Memory& memory)
+    {
+        hub_->transit.setLimits([&memory] { return memory.limits(); });
     }
     // `resume` calls the handler once, as soon as new clients are served. Call this before `resume`.
     void setListeningHandler(std::move_only_function<void()> handler) { listeningHandler_ = std::move(handler); }
@@ -88,9 +97,9 @@ private:
 
     [[nodiscard]] bool watch(int operation, int descriptor, std::uint32_t events, void* tag);
     void serve();
-    void wake();
     [[nodiscard]] int waitingTime() const;
     void handle(const epoll_event& event);
+    void lookForRoom();
     void serveReaders();
     [[nodiscard]] bool serve(Reader& reader, std::size_t mostBytes);
     void acceptWaiting();
@@ -100,7 +109,6 @@ private:
     void resumeAccepting();
 
     ListeningSocket socket_;
-    FileDescriptor wake_;
     const std::shared_ptr<ConnectionHub> hub_;
     const std::size_t mostConnections_;
     const std::size_t mostConnectionsOfAUser_;
@@ -112,6 +120,8 @@ private:
     // Only for the connection thread.
     std::unordered_map<const void*, std::shared_ptr<Reader>> connections_; // by connection
     FairShares ready_; // readers
+    std::unordered_set<std::shared_ptr<Reader>> waitingForRoom_; // in the memory of all connections
+    Clock::time_point lookForRoomAt_; // if some wait
     std::unordered_map<std::uint32_t, User> users_; // by number
     bool isAccepting_ = false;
     bool pauseIsLogged_ = false;

@@ -8,12 +8,27 @@
 
 namespace platform {
 
+namespace {
+
+// Items that came together, and what they hold.
+struct Batch {
+    std::uint64_t end; // the number of the item behind them
+    std::size_t bytes;
+};
+
+} // namespace
+
 struct FairOrder::Lane : FairShares::Share {
     std::deque<Item> items;
+    std::uint64_t added = 0; // items, ever; those that continue a pause do not count again
+    std::deque<Batch> batches; // that have not run whole
     bool isPausing = false;
     std::size_t together = 1; // items that are taken at once
     bool wantsRoom = false;
     std::shared_ptr<const RoomHandler> roomHandler;
+    ReleaseHandler releaseHandler;
+
+    void release();
 };
 
 namespace {
@@ -39,6 +54,7 @@ std::shared_ptr<FairOrder::Lane> FairOrder::makeLane(std::uint32_t user)
 void FairOrder::add(const std::shared_ptr<Lane>& lane, Item item)
 {
     lane->items.push_back(std::move(item));
+    ++lane->added;
     if (lane->isPausing) {
         ++heldBack_;
         return;
@@ -67,14 +83,31 @@ void FairOrder::resume(const std::shared_ptr<Lane>& lane, Item item)
     shares_.enter(lane);
 }
 
-bool FairOrder::isFull(Lane& lane)
+bool FairOrder::isFull(Lane& lane, std::size_t heldBytes)
 {
+    if (heldBytes != 0)
+        lane.batches.push_back({lane.added, heldBytes});
+    if (!lane.wantsTime) // it may all have run already
+        lane.release();
     return lane.wantsRoom = lane.items.size() >= mostWaiting;
 }
 
 void FairOrder::setRoomHandler(Lane& lane, std::shared_ptr<const RoomHandler> handler)
 {
     lane.roomHandler = std::move(handler);
+}
+
+void FairOrder::setReleaseHandler(Lane& lane, ReleaseHandler handler)
+{
+    lane.releaseHandler = std::move(handler);
+}
+
+void FairOrder::Lane::release()
+{
+    const std::uint64_t ran = added - items.size();
+    for (; !batches.empty() && batches.front().end <= ran; batches.pop_front())
+        if (releaseHandler)
+            releaseHandler(batches.front().bytes);
 }
 
 const FairOrder::Item& FairOrder::front() const
@@ -103,6 +136,7 @@ void FairOrder::charge(Duration time)
     auto& lane = static_cast<Lane&>(shares_.first());
     lane.together =
         time < longTogether ? std::min(2 * lane.together, mostTogether) : std::max<std::size_t>(lane.together / 2, 1);
+    lane.release();
     shares_.charge(time, !lane.items.empty() && !lane.isPausing);
 }
 

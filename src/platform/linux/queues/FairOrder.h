@@ -27,13 +27,16 @@ public:
     struct Lane;
 
     using RoomHandler = std::function<void()>;
+    using ReleaseHandler = std::function<void(std::size_t bytes)>;
 
     [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user);
     void add(const std::shared_ptr<Lane>& lane, Item item);
 
-    // Whether so many items of the lane wait that its submitter should pause. `take` then says when few are left.
-    [[nodiscard]] static bool isFull(Lane& lane);
+    // Whether so many items of the lane wait that its submitter should pause. `take` then says when few are left. What
+    // was added since the last call holds so many bytes: the release handler gets them when all of it has run.
+    [[nodiscard]] static bool isFull(Lane& lane, std::size_t heldBytes);
     static void setRoomHandler(Lane& lane, std::shared_ptr<const RoomHandler> handler);
+    static void setReleaseHandler(Lane& lane, ReleaseHandler handler);
 
     // The lane's items no longer wait, until `resume` makes this item its first. The lane must be the one that is being
     // served, and its item must have come alone.
@@ -53,7 +56,7 @@ public:
     // that may take long comes alone. `charge` must be called before the next call of this. Returns the lane's handler
     // if it was full and has room again.
     [[nodiscard]] std::shared_ptr<const RoomHandler> take(std::vector<Item>& items, std::size_t most);
-    // What was taken last took so long.
+    // What was taken last has run, and took so long.
     void charge(Duration time);
 
 private:

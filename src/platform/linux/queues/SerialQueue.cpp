@@ -35,10 +35,16 @@ public:
         return order_.makeLane(user);
     }
 
-    [[nodiscard]] bool isFull(FairOrder::Lane& lane)
+    [[nodiscard]] bool isFull(FairOrder::Lane& lane, std::size_t heldBytes)
     {
         const foundation::Lock lock(lock_);
-        return FairOrder::isFull(lane);
+        return FairOrder::isFull(lane, heldBytes);
+    }
+
+    void setReleaseHandler(FairOrder::Lane& lane, FairOrder::ReleaseHandler handler)
+    {
+        const foundation::Lock lock(lock_);
+        FairOrder::setReleaseHandler(lane, std::move(handler));
     }
 
     void setRoomHandler(FairOrder::Lane& lane, std::function<void()> handler)
@@ -298,7 +304,11 @@ public:
     {
         return std::make_shared<QueueLane>(work_, user);
     }
-    [[nodiscard]] bool isFull() override { return work_->isFull(*lane_); }
+    [[nodiscard]] bool isFull(std::size_t heldBytes) override { return work_->isFull(*lane_, heldBytes); }
+    void setReleaseHandler(std::function<void(std::size_t bytes)> handler) override
+    {
+        work_->setReleaseHandler(*lane_, std::move(handler));
+    }
     void setRoomHandler(std::function<void()> handler) override { work_->setRoomHandler(*lane_, std::move(handler)); }
     [[nodiscard]] Resume pause() override
     {

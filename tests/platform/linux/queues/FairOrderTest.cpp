@@ -197,9 +197,9 @@ TEST_F(FairOrderTest, ALaneIsFullWith512ItemsAndHasRoomAgainWith256)
     int calls = 0;
     FairOrder::setRoomHandler(*lane, std::make_shared<const FairOrder::RoomHandler>([&] { ++calls; }));
     addMany(lane, "a", 511);
-    EXPECT_FALSE(FairOrder::isFull(*lane));
+    EXPECT_FALSE(FairOrder::isFull(*lane, 0));
     add(lane, "a");
-    EXPECT_TRUE(FairOrder::isFull(*lane));
+    EXPECT_TRUE(FairOrder::isFull(*lane, 0));
     std::vector<FairOrder::Item> items;
     std::shared_ptr<const FairOrder::RoomHandler> handler;
     while (handler == nullptr) {
@@ -267,6 +267,50 @@ TEST_F(FairOrderTest, AUserThatCameBackIsServedLikeTheOthers)
     const Lane back = order.makeLane(alice);
     addMany(back, "alice", 10);
     EXPECT_THAT(serveTimes(4, 1ms), ElementsAre("alice", "bob", "alice", "bob"));
+}
+
+TEST_F(FairOrderTest, ReleasesWhatItemsHoldWhenAllThatCameTogetherHaveRun)
+{
+    const Lane lane = order.makeLane(alice);
+    std::vector<std::size_t> released;
+    FairOrder::setReleaseHandler(*lane, [&](std::size_t bytes) { released.push_back(bytes); });
+    addMany(lane, "first", 2);
+    EXPECT_FALSE(FairOrder::isFull(*lane, 10));
+    addMany(lane, "second", 1);
+    EXPECT_FALSE(FairOrder::isFull(*lane, 20));
+    EXPECT_THAT(serve(1ms), SizeIs(1));
+    EXPECT_THAT(released, IsEmpty());
+    EXPECT_THAT(serve(1ms), SizeIs(1));
+    EXPECT_THAT(released, ElementsAre(10));
+    EXPECT_THAT(serve(1ms), SizeIs(1));
+    EXPECT_THAT(released, ElementsAre(10, 20));
+}
+
+TEST_F(FairOrderTest, ReleasesAtOnceWhatItemsHeldThatHaveRunAlready)
+{
+    const Lane lane = order.makeLane(alice);
+    std::vector<std::size_t> released;
+    FairOrder::setReleaseHandler(*lane, [&](std::size_t bytes) { released.push_back(bytes); });
+    addMany(lane, "a", 1);
+    serve(1ms);
+    EXPECT_FALSE(FairOrder::isFull(*lane, 10));
+    EXPECT_THAT(released, ElementsAre(10));
+}
+
+TEST_F(FairOrderTest, DoesNotReleaseWhatItemsHoldBehindAPause)
+{
+    const Lane lane = order.makeLane(alice);
+    std::vector<std::size_t> released;
+    FairOrder::setReleaseHandler(*lane, [&](std::size_t bytes) { released.push_back(bytes); });
+    order.add(lane, {[&](Turn&) { order.pause(*lane); }, true});
+    add(lane, "behind");
+    EXPECT_FALSE(FairOrder::isFull(*lane, 10));
+    EXPECT_THAT(serve(1ms), IsEmpty());
+    order.resume(lane, {[](Turn&) { }, true});
+    EXPECT_THAT(serve(1ms), IsEmpty());
+    EXPECT_THAT(released, IsEmpty());
+    EXPECT_THAT(serve(1ms), ElementsAre("behind"));
+    EXPECT_THAT(released, ElementsAre(10));
 }
 
 } // namespace

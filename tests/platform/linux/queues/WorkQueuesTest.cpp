@@ -448,9 +448,9 @@ TEST_F(LanesTest, AFullLaneSaysOnceWhenItHasRoomAgain)
     hold();
     for (int item = 0; item < 511; ++item)
         submit(*lane, "a");
-    EXPECT_FALSE(lane->isFull());
+    EXPECT_FALSE(lane->isFull(0));
     submit(*lane, "a");
-    EXPECT_TRUE(lane->isFull());
+    EXPECT_TRUE(lane->isFull(0));
     EXPECT_EQ(calls, 0);
     go();
     queue.reset();
