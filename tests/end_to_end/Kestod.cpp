@@ -12,6 +12,7 @@
 #include <sqlite3.h>
 #include <stdexcept>
 #include <sys/mount.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -106,6 +107,9 @@ void Kestod::start(const InheritedDescriptors& inherited)
             char* digits = variables.back().data() + passedTo.size();
             std::to_chars(digits, digits + longestPID, ::getpid());
         }
+        const rlimit descriptors{mostDescriptors_.value_or(0), mostDescriptors_.value_or(0)};
+        if (mostDescriptors_ && ::setrlimit(RLIMIT_NOFILE, &descriptors) != 0)
+            ::_exit(127);
         ::signal(SIGPIPE, SIG_DFL); // as in a shell; the test may have inherited another setting
         char name[] = "kestod";
         char* arguments[] = {name, nullptr};

@@ -63,6 +63,9 @@ public:
     // Needs the right to mount.
     void hide(const std::filesystem::path& folder) { hidden_ = folder; }
 
+    // From the next start on the process may have so many descriptors.
+    void limitDescriptors(unsigned count) { mostDescriptors_ = count; }
+
     // From the next start on the process sees the time of day shifted by so much; further calls take effect at once.
     void shiftClock(std::chrono::seconds shift);
 
@@ -103,6 +106,7 @@ private:
     const support::TemporaryDirectory directory_;
     Environment environment_;
     std::filesystem::path hidden_; // empty: none
+    std::optional<unsigned> mostDescriptors_; // nothing: as many as the test
     pid_t process_ = 0;
 };
 

@@ -48,6 +48,17 @@ INSTANTIATE_TEST_SUITE_P(
         BadLaunch{"ALogLevelThatDoesNotExist", {{"KESTO_LOG", "loud"}}, "KESTO_LOG"}),
     [](const auto& input) { return input.param.name; });
 
+TEST(LaunchTest, WithTooFewDescriptorsForItselfItSaysSoAndDoesNotStart)
+{
+    Kestod kestod;
+    kestod.limitDescriptors(63);
+    kestod.start();
+    EXPECT_EQ(kestod.exitStatus(), cannotRun);
+    EXPECT_EQ(kestod.log(),
+              "kestod: RLIMIT_NOFILE: the service needs 64 descriptors and may have 63: raise LimitNOFILE "
+              "of its unit, or \"ulimit -n\"\n");
+}
+
 TEST(LaunchTest, ASecondServiceAtTheSameSocketGivesWay)
 {
     Kestod first;

@@ -1,6 +1,7 @@
 // Every variable is read, even after a problem, and the first problem is kept: so the checks read as a list.
 #include "platform/linux/LaunchConfiguration.h"
 
+#include "platform/linux/connection/LinuxConnectionListener.h"
 #include "platform/linux/process/Environment.h"
 
 #include <cerrno>
@@ -89,6 +90,15 @@ public:
         return {};
     }
 
+    void checkDescriptors()
+    {
+        constexpr std::size_t least = LinuxConnectionListener::leastDescriptors;
+        if (const std::size_t most = LinuxConnectionListener::mostDescriptors(); most < least)
+            fail("RLIMIT_NOFILE: the service needs {} descriptors and may have {}: raise LimitNOFILE of its unit, or "
+                 "\"ulimit -n\"",
+                 least, most);
+    }
+
 private:
     static constexpr std::size_t longestSocketPath = sizeof(sockaddr_un::sun_path) - 1;
 
@@ -118,6 +128,7 @@ std::expected<LaunchConfiguration, std::string> LaunchConfiguration::fromEnviron
     configuration.logsDirectory = reader.writableDirectory("LOGS_DIRECTORY", "diagnostic files");
     configuration.configurationDirectory = reader.directory("CONFIGURATION_DIRECTORY", "the configuration");
     configuration.logThresholds = reader.logThresholds("KESTO_LOG");
+    reader.checkDescriptors();
 
     if (const std::string channelRoot = environment("KESTO_CHANNEL_ROOT"); !channelRoot.empty())
         configuration.channelRoot = fs::absolute(channelRoot);

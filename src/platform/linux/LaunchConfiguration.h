@@ -27,9 +27,9 @@ struct LaunchConfiguration {
     std::filesystem::path soundRoot = "/proc/asound"; // the kernel's sound cards; not set from the environment
     LogThresholds logThresholds = {};
 
-    // Reads the environment and checks the directories. The error is one line for a person that names what is missing
-    // or cannot be used, and what to do. Call it once, before the first thread starts, because it removes a passed
-    // socket from the environment.
+    // Reads the environment, and checks the directories and the limit of descriptors. The error is one line for a
+    // person that names what is missing or cannot be used, and what to do. Call it once, before the first thread
+    // starts, because it removes a passed socket from the environment.
     [[nodiscard]] static std::expected<LaunchConfiguration, std::string> fromEnvironment();
 };
 

@@ -27,19 +27,23 @@ constexpr std::size_t mostEventsAtOnce = 64;
 constexpr std::chrono::microseconds longestReading{25};
 constexpr std::size_t leastRead = 256;
 
-std::size_t mostConnections()
+std::size_t mostConnections(std::size_t descriptors)
 {
-    rlimit limit = {};
-    ::getrlimit(RLIMIT_NOFILE, &limit);
-    const std::size_t descriptors = limit.rlim_cur;
-    return std::max(descriptors, LinuxConnectionListener::descriptorsForTheRest + 1)
-        - LinuxConnectionListener::descriptorsForTheRest;
+    return descriptors - std::min(LinuxConnectionListener::descriptorsForTheRest, descriptors / 2);
 }
 
 } // namespace
 
+std::size_t LinuxConnectionListener::mostDescriptors()
+{
+    rlimit limit = {};
+    ::getrlimit(RLIMIT_NOFILE, &limit);
+    return limit.rlim_cur;
+}
+
 std::expected<std::unique_ptr<LinuxConnectionListener>, std::error_code>
-LinuxConnectionListener::create(ListeningSocket socket, ledger::Ledger& ledger, LogCategory& log)
+LinuxConnectionListener::create(ListeningSocket socket, ledger::Ledger& ledger, LogCategory& log,
+                                std::size_t descriptors)
 {
     FileDescriptor epoll(::epoll_create1(EPOLL_CLOEXEC));
     if (!epoll)
@@ -48,7 +52,7 @@ LinuxConnectionListener::create(ListeningSocket socket, ledger::Ledger& ledger, 
     if (!wake)
         return std::unexpected(systemError());
     std::unique_ptr<LinuxConnectionListener> listener(
-        new LinuxConnectionListener(std::move(socket), std::move(epoll), std::move(wake), ledger, log));
+        new LinuxConnectionListener(std::move(socket), std::move(epoll), std::move(wake), ledger, log, descriptors));
     if (!listener->watch(EPOLL_CTL_ADD, listener->hub_->wake.get(), EPOLLIN | EPOLLET, &listener->hub_->wake)
         || !listener->watch(EPOLL_CTL_ADD, listener->socket_.descriptor(), 0, &listener->socket_))
         return std::unexpected(systemError());
@@ -56,10 +60,10 @@ LinuxConnectionListener::create(ListeningSocket socket, ledger::Ledger& ledger, 
 }
 
 LinuxConnectionListener::LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake,
-                                                 ledger::Ledger& ledger, LogCategory& log)
+                                                 ledger::Ledger& ledger, LogCategory& log, std::size_t descriptors)
     : socket_(std::move(socket)),
       hub_(std::make_shared<ConnectionHub>(std::move(epoll), std::move(wake), log, ledger)),
-      mostConnections_(mostConnections()),
+      mostConnections_(mostConnections(descriptors)),
       mostConnectionsOfAUser_(mostConnections_ - mostConnections_ / partForOthers)
 {
 }

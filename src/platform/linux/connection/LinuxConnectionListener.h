@@ -36,8 +36,13 @@ namespace platform {
 
 class LinuxConnectionListener final : public ConnectionListener {
 public:
-    // How many of the process's descriptors clients cannot take.
+    // How many of the process's descriptors clients cannot take; but never more than half of them.
     static constexpr std::size_t descriptorsForTheRest = 64;
+    // With fewer descriptors the half that clients cannot take may be too small for the service itself: it has some 16
+    // files open when it is idle, and some more while it samples channels, captures a bug or writes a file.
+    static constexpr std::size_t leastDescriptors = 64;
+    // How many this process may have.
+    [[nodiscard]] static std::size_t mostDescriptors();
     // The part (a fourth) of all other descriptors that one user alone cannot take. Further connections of a user are
     // closed immediately, so that no user keeps the others out.
     static constexpr std::size_t partForOthers = 4;
@@ -47,9 +52,10 @@ public:
     static constexpr std::chrono::milliseconds lookingPause{1000};
 
     // The ledger counts the connections, and the category gets a line for each that breaks. Fails if the system has no
-    // descriptors left.
+    // descriptors left. With so many descriptors in all.
     [[nodiscard]] static std::expected<std::unique_ptr<LinuxConnectionListener>, std::error_code>
-    create(ListeningSocket socket, ledger::Ledger& ledger, LogCategory& log);
+    create(ListeningSocket socket, ledger::Ledger& ledger, LogCategory& log,
+           std::size_t descriptors = mostDescriptors());
 
     void setDelegate(ConnectionListenerDelegate& delegate) override { delegate_ = &delegate; }
     // Gives the trace's marker and switch page to clients that ask. Call this before `resume`.
@@ -93,7 +99,7 @@ private:
     };
 
     LinuxConnectionListener(ListeningSocket socket, FileDescriptor epoll, FileDescriptor wake, ledger::Ledger& ledger,
-                            LogCategory& log);
+                            LogCategory& log, std::size_t descriptors);
 
     [[nodiscard]] bool watch(int operation, int descriptor, std::uint32_t events, void* tag);
     void serve();

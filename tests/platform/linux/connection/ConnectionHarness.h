@@ -58,7 +58,8 @@ protected:
     {
         auto socket = platform::ListeningSocket::bind(path);
         ASSERT_TRUE(socket) << description(socket.error());
-        auto created = platform::LinuxConnectionListener::create(*std::move(socket), ledger, connectionTestCategory);
+        auto created =
+            platform::LinuxConnectionListener::create(*std::move(socket), ledger, connectionTestCategory, descriptors);
         ASSERT_TRUE(created) << created.error().message();
         listener = *std::move(created);
         listener->setDelegate(*this);
@@ -140,6 +141,7 @@ protected:
     Handler handler; // instead of keeping the call
     std::function<void(platform::Connection&)> beforeResuming; // on the connection thread
     std::function<void()> beforeListening; // sets up the listener
+    std::size_t descriptors = platform::LinuxConnectionListener::mostDescriptors();
     ledger::Ledger ledger;
     std::unique_ptr<platform::LinuxConnectionListener> listener;
     std::thread thread;

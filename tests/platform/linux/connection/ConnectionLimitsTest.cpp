@@ -381,11 +381,9 @@ TEST_F(Descriptors, ClientsAreAcceptedAfterAPauseWhenDescriptorsWereFreedElsewhe
 
 TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
 {
-    constexpr std::size_t most = 8;
-    constexpr std::size_t mostOfOneUser = most - most / LinuxConnectionListener::partForOthers;
-    limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
+    constexpr std::size_t mostOfOneUser = 6; // three quarters of the half that the service itself does not keep
+    descriptors = 16;
     listen();
-    ::setrlimit(RLIMIT_NOFILE, &before);
     std::vector<std::unique_ptr<SocketClient>> clients;
     for (std::size_t index = 0; index < mostOfOneUser; ++index) {
         clients.push_back(std::make_unique<SocketClient>(path));
@@ -412,9 +410,8 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
 TEST_F(Descriptors, SomeAreKeptFromClients)
 {
     constexpr std::size_t most = 3;
-    limitTo(LinuxConnectionListener::descriptorsForTheRest + most);
+    descriptors = 6;
     listen();
-    ::setrlimit(RLIMIT_NOFILE, &before); // the limit at the start counts
     std::vector<std::unique_ptr<SocketClient>> clients;
     for (std::size_t index = 0; index < most; ++index) {
         clients.push_back(std::make_unique<SocketClient>(path));
@@ -427,6 +424,21 @@ TEST_F(Descriptors, SomeAreKeptFromClients)
     clients.pop_back();
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
     EXPECT_THAT(logged(), ElementsAre("new connections have to wait, with 3 open: Too many open files"));
+}
+
+TEST_F(Descriptors, NoMoreThan64AreKeptFromClients)
+{
+    constexpr std::size_t mostOfOneUser = 102; // of 200, 136 are for clients; of these a fourth for other users
+    descriptors = 200;
+    listen();
+    std::vector<std::unique_ptr<SocketClient>> clients;
+    for (std::size_t index = 0; index < mostOfOneUser; ++index) {
+        clients.push_back(std::make_unique<SocketClient>(path));
+        connected();
+    }
+    EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt);
+    EXPECT_EQ(counted(Counter::ConnectionsAccepted), 102U);
+    EXPECT_EQ(counted(Counter::ConnectionsRefused), 1U);
 }
 
 } // namespace
