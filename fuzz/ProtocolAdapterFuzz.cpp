@@ -86,7 +86,7 @@ public:
     void setCallHandler(CallHandler) override { }
     void setInterruptionHandler(EndHandler) override { }
     void setInvalidationHandler(EndHandler) override { }
-    void setLane(std::shared_ptr<platform::Lane>) override { }
+    void setLane(std::shared_ptr<platform::Lane>, std::shared_ptr<ledger::Workload>) override { }
     void resume() override { }
     void send(platform::Turn&, std::string frame) override { sent.push_back(std::move(frame)); }
     void write(std::string) override { }

@@ -68,7 +68,7 @@ private:
         void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
         void setInterruptionHandler(EndHandler) override { }
         void setInvalidationHandler(EndHandler) override { }
-        void setLane(std::shared_ptr<platform::Lane>) override { }
+        void setLane(std::shared_ptr<platform::Lane>, std::shared_ptr<ledger::Workload>) override { }
         void resume() override { }
         void send(platform::Turn&, std::string) override { }
         void write(std::string) override { }

@@ -71,6 +71,7 @@ private:
         [[nodiscard]] bool isFull(std::size_t) override { return false; }
         void setRoomHandler(std::function<void()>) override { }
         void setReleaseHandler(std::function<void(std::size_t)>) override { }
+        void setWorkload(std::shared_ptr<ledger::Workload>) override { }
         [[nodiscard]] Resume pause() override
         {
             return [this](platform::TurnItem item) { submit(std::move(item)); };

@@ -8,6 +8,7 @@
 #include "foundation/Mutex.h"
 #include "ledger/LastMinute.h"
 #include "ledger/LedgerImage.h"
+#include "ledger/Workload.h"
 
 #include <array>
 #include <atomic>
@@ -49,6 +50,10 @@ public:
     };
     [[nodiscard]] Rates lastMinute() const;
 
+    // Who makes the service work, since the start of the process.
+    [[nodiscard]] Workloads& workloads() noexcept { return workloads_; }
+    [[nodiscard]] const Workloads& workloads() const noexcept { return workloads_; }
+
     // Does the work while nothing is posted, so that it may move the image's bytes to another place behind the same
     // address. Single counts go on meanwhile.
     template <typename Work> void withoutPosts(Work work)
@@ -78,6 +83,7 @@ private:
     std::array<Culprits, chargeCount> culpritsSinceStart_ KESTO_GUARDED_BY(lock_);
     LastMinute deliveries_ KESTO_GUARDED_BY(lock_);
     LastMinute events_ KESTO_GUARDED_BY(lock_);
+    Workloads workloads_;
     std::atomic<bool> isChangeAwaited_ = false;
     std::move_only_function<void()> changeHandler_ KESTO_GUARDED_BY(changeLock_);
     foundation::Mutex changeLock_;

@@ -50,7 +50,7 @@ Array culprits(const std::vector<CulpritCount>& largest, std::uint64_t all)
     return list;
 }
 
-Dictionary who(const Account& account)
+Dictionary::Entries who(const Account& account)
 {
     Dictionary::Entries entries;
     for (std::size_t place = 0; place < chargeCount; ++place) {
@@ -60,12 +60,49 @@ Dictionary who(const Account& account)
     return entries;
 }
 
-Dictionary::Entries counts(const Account& account, bool withCulprits)
+Dictionary::Entries counts(const Account& account)
 {
     Rows rows = counterRows();
-    Dictionary::Entries entries = takeCounts(account, {}, rows);
+    return takeCounts(account, {}, rows);
+}
+
+Dictionary::Entries counts(const Account& account, bool withCulprits)
+{
+    Dictionary::Entries entries = counts(account);
     if (withCulprits)
-        entries.push_back({"who", who(account)});
+        entries.push_back({"who", Dictionary(who(account))});
+    return entries;
+}
+
+// The entries of a work, behind those that say whose it is.
+Value work(Dictionary::Entries whose, const Work& work)
+{
+    whose.push_back({"calls", work.calls});
+    whose.push_back({"microseconds",
+                     std::chrono::floor<std::chrono::microseconds>(work.time).count()}); // no floats, as for seconds
+    whose.push_back({"bytes", work.bytes});
+    return Dictionary(std::move(whose));
+}
+
+Array workByWhom(const WorkByWhom& byWhom)
+{
+    std::vector<Value> list;
+    for (const auto& [user, process, each] : byWhom.largest)
+        list.push_back(work({{"user", user}, {"process", process}}, each));
+    if (byWhom.others != Work())
+        list.push_back(work({}, byWhom.others));
+    return list;
+}
+
+// Of the run; only while it lasts is it known who works.
+Dictionary countsOfRun(const Ledger& ledger, const Account& sinceStart, bool withCulprits)
+{
+    Dictionary::Entries entries = counts(sinceStart);
+    if (withCulprits) {
+        Dictionary::Entries whose = who(sinceStart);
+        whose.push_back({"time", workByWhom(ledger.workloads().byWhom())});
+        entries.push_back({"who", Dictionary(std::move(whose))});
+    }
     return entries;
 }
 
@@ -126,7 +163,7 @@ Dictionary report(const Ledger& ledger, const ServiceProcess& process, bool with
                   {"now", now(sinceStart)},
                   {"rates", Dictionary{{"deliveries", deliveries}, {"events", events}}},
                   {"memory", memory(process.memory())}},
-                 ledger.account(), withCulprits, Dictionary(counts(sinceStart, withCulprits)));
+                 ledger.account(), withCulprits, countsOfRun(ledger, sinceStart, withCulprits));
 }
 
 Dictionary report(const Account& account, bool withCulprits)

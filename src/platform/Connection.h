@@ -71,8 +71,9 @@ public:
     virtual void setInterruptionHandler(EndHandler handler) = 0;
     virtual void setInvalidationHandler(EndHandler handler) = 0;
 
-    // The lane on which the calls are carried out: while it is full, the connection stops reading. Before `resume`.
-    virtual void setLane(std::shared_ptr<Lane> lane) = 0;
+    // The lane on which the calls are carried out: while it is full, the connection stops reading. What the client
+    // makes the service do counts in the workload. Before `resume`.
+    virtual void setLane(std::shared_ptr<Lane> lane, std::shared_ptr<ledger::Workload> workload) = 0;
 
     // Starts reading. Connection thread, in `shouldAcceptNewConnection`.
     virtual void resume() = 0;

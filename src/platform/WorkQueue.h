@@ -16,6 +16,7 @@
 // No queue polls. An empty queue has a sleeping thread, or none.
 #pragma once
 
+#include "ledger/Workload.h"
 #include "platform/Turn.h"
 
 #include <chrono>
@@ -75,6 +76,9 @@ public:
     // under the queue's lock, so that it must not use the queue. Set both before `isFull` is called.
     virtual void setRoomHandler(std::function<void()> handler) = 0;
     virtual void setReleaseHandler(std::function<void(std::size_t bytes)> handler) = 0;
+
+    // From now on the time that the lane's items take counts there. Any thread.
+    virtual void setWorkload(std::shared_ptr<ledger::Workload> workload) = 0;
 
     // Continues a lane that pauses: its next item is this one, as by `submitLong`. Any thread.
     using Resume = std::move_only_function<void(TurnItem item)>;

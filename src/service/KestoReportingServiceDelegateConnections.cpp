@@ -25,10 +25,14 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
                 platform::Connection::Call call) mutable { return adapter.handleCall(std::move(call)); });
     }
     const std::weak_ptr<Client> weakClient = client;
-    connection->setLane(client->queue());
-    client->queue()->submit([self = shared_from_this(), weakClient](platform::Turn& turn) {
-        if (const auto registered = weakClient.lock())
+    ledger::Workloads& workloads = platform::current().ledger.workloads();
+    const auto workload = workloads.open(connection->userIdentifier());
+    connection->setLane(client->queue(), workload);
+    client->queue()->submit([self = shared_from_this(), weakClient, workload, &workloads](platform::Turn& turn) {
+        if (const auto registered = weakClient.lock()) {
             self->registerClient(turn, registered);
+            workloads.setProcess(*workload, registered->clientProcessName().value_or(std::string()));
+        }
     });
     connection->setInterruptionHandler([weakClient] {
         KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "interruptionHandler: connection exited");

@@ -176,8 +176,38 @@ TEST(Report, NamesCulpritsOnlyOnRequest)
     const std::string expected =
         R"({"refused":[{"user":1000,"process":"player","application":"org.example","count":3}],"lost":[],"removed":[]})";
     EXPECT_EQ(at(report(ledger, process, true), "who").text(), expected);
-    EXPECT_EQ(at(report(ledger, process, true), "sinceStart.who").text(), expected);
+    EXPECT_EQ(at(report(ledger, process, true), "sinceStart.who").text(),
+              expected.substr(0, expected.size() - 1) + R"(,"time":[]})");
     EXPECT_EQ(at(report(ledger.account(), true), "who").text(), expected);
+}
+
+TEST(Report, SaysWhoTookTheTimeOfTheRunOnlyOnRequest)
+{
+    using namespace std::chrono_literals;
+    Ledger ledger;
+    const auto workload = ledger.workloads().open(1000);
+    ledger.workloads().setProcess(*workload, "player");
+    workload->received(3, 700);
+    workload->took(2'000'001'999ns);
+    EXPECT_EQ(at(report(ledger, process, true), "sinceStart.who.time").text(),
+              R"([{"user":1000,"process":"player","calls":3,"microseconds":2000001,"bytes":700}])");
+    EXPECT_EQ(at(report(ledger, process, true), "who.time"), Value("missing")) << "only the run is known";
+    EXPECT_EQ(at(report(ledger, process, false), "sinceStart.who"), Value("missing"));
+}
+
+TEST(Report, SumsUpTheTimeOfThoseBeyondTheTenLargest)
+{
+    Ledger ledger;
+    std::vector<std::shared_ptr<Workload>> workloads;
+    for (std::uint32_t user = 1; user <= 12; ++user) {
+        workloads.push_back(ledger.workloads().open(user));
+        workloads.back()->received(1, 10);
+        workloads.back()->took(std::chrono::microseconds(user));
+    }
+    const auto list = *at(report(ledger, process, true), "sinceStart.who.time").array();
+    ASSERT_EQ(list.size(), 11U);
+    EXPECT_EQ(list[0].text(), R"({"user":12,"process":"","calls":1,"microseconds":12,"bytes":10})");
+    EXPECT_EQ(list[10].text(), R"({"calls":2,"microseconds":3,"bytes":20})");
 }
 
 TEST(Report, SumsUpTheCulpritsBeyondTheTenLargest)

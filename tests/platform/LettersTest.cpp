@@ -23,7 +23,7 @@ public:
     void setCallHandler(CallHandler /*handler*/) override { }
     void setInterruptionHandler(EndHandler /*handler*/) override { }
     void setInvalidationHandler(EndHandler /*handler*/) override { }
-    void setLane(std::shared_ptr<Lane> /*lane*/) override { }
+    void setLane(std::shared_ptr<Lane>, std::shared_ptr<ledger::Workload>) override { }
     void resume() override { }
     void send(Turn& /*turn*/, std::string /*frame*/) override { }
     void write(std::string letter) override { post_.push_back(name_ + ": " + letter); }

@@ -68,6 +68,7 @@ public:
     {
         releaseHandler_ = std::move(handler);
     }
+    void setWorkload(std::shared_ptr<ledger::Workload>) override { } // its items take no time
     [[nodiscard]] Resume pause() override
     {
         isPausing_ = true;

@@ -30,6 +30,8 @@ std::string sizeText(std::uint64_t bytes)
     constexpr double kilobyte = 1'000;
     constexpr double megabyte = 1'000'000;
     const auto size = static_cast<double>(bytes);
+    if (size < kilobyte)
+        return fmt::format("{} B", bytes);
     return size < megabyte ? fmt::format("{:.0f} kB", size / kilobyte) : fmt::format("{:.1f} MB", size / megabyte);
 }
 
@@ -49,6 +51,7 @@ public:
         addCounts();
         addProblems();
         addCulprits();
+        addWork();
         return std::move(text_);
     }
 
@@ -181,6 +184,34 @@ private:
         constexpr std::size_t processColumns = 17;
         addLine(fmt::format("{}{:>{}}{:>{}}  {}{}", padded(std::string(charge), chargeColumns), user, userColumns,
                             count, numberColumns, padded(printable(process), processColumns), printable(application)));
+    }
+
+    // Only a running service knows it.
+    void addWork()
+    {
+        const Value* const who = sinceStart_.find("who");
+        const Value* const time = who == nullptr ? nullptr : who->dictionary().value_or(Dictionary()).find("time");
+        const foundation::Array works =
+            time == nullptr ? foundation::Array() : time->array().value_or(foundation::Array());
+        if (works.empty())
+            return;
+        text_ += '\n';
+        addWork("TIME TAKEN", "USER", "CALLS", "RECEIVED", "PROCESS, SINCE START");
+        for (const Value& each : works) {
+            const Dictionary work = *each.dictionary();
+            const bool hasName = work.contains("user");
+            constexpr double second = 1'000'000;
+            addWork(fmt::format("{:.3f} s", static_cast<double>(numberIn(work, "microseconds")) / second),
+                    hasName ? work.find("user")->text() : "-", groupedText(numberIn(work, "calls")),
+                    sizeText(numberIn(work, "bytes")),
+                    hasName ? printable(work.find("process")->text()) : "all others");
+        }
+    }
+
+    void addWork(std::string_view time, std::string_view user, std::string_view calls, std::string_view received,
+                 std::string_view process)
+    {
+        addLine(fmt::format("{:>14}{:>12}{:>18}{:>12}  {}", time, user, calls, received, process));
     }
 
     const Dictionary& report_;

@@ -76,9 +76,11 @@ std::string LinuxConnection::description() const
     return fmt::format("connection of process {} (user {})", peer_.processIdentifier, peer_.userIdentifier);
 }
 
-void LinuxConnection::setLane(std::shared_ptr<Lane> lane)
+void LinuxConnection::setLane(std::shared_ptr<Lane> lane, std::shared_ptr<ledger::Workload> workload)
 {
     lane_ = std::move(lane);
+    workload_ = std::move(workload);
+    lane_->setWorkload(workload_);
     lane_->setRoomHandler([weak = weak_from_this()] {
         if (const auto self = weak.lock()) {
             self->isLaneFull_ = false;
@@ -206,6 +208,8 @@ void LinuxConnection::takeIn(std::string_view bytes)
     input_.feed(bytes);
     const auto decoded = decodeFrames();
     countPart();
+    if (workload_ != nullptr)
+        workload_->received(hub_->calls.size(), bytes.size());
     const auto delivered = deliverCalls();
     if (!delivered)
         breakOff(delivered.error().reason);

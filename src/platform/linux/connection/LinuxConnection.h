@@ -61,7 +61,7 @@ public:
     void setCallHandler(CallHandler handler) override { callHandler_ = std::move(handler); }
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
-    void setLane(std::shared_ptr<Lane> lane) override;
+    void setLane(std::shared_ptr<Lane> lane, std::shared_ptr<ledger::Workload> workload) override;
     void resume() override;
     void send(Turn& turn, std::string frame) override;
     void write(std::string frames) override;
@@ -127,6 +127,7 @@ private:
 
     // Only for the connection thread.
     std::shared_ptr<Lane> lane_; // null: it is never full
+    std::shared_ptr<ledger::Workload> workload_; // null without a lane
     CallHandler callHandler_;
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;

@@ -27,6 +27,7 @@ struct FairOrder::Lane : FairShares::Share {
     bool wantsRoom = false;
     std::shared_ptr<const RoomHandler> roomHandler;
     ReleaseHandler releaseHandler;
+    std::shared_ptr<ledger::Workload> workload; // null: its time is not counted
 
     void release();
 };
@@ -102,6 +103,11 @@ void FairOrder::setReleaseHandler(Lane& lane, ReleaseHandler handler)
     lane.releaseHandler = std::move(handler);
 }
 
+void FairOrder::setWorkload(Lane& lane, std::shared_ptr<ledger::Workload> workload)
+{
+    lane.workload = std::move(workload);
+}
+
 void FairOrder::Lane::release()
 {
     const std::uint64_t ran = added - items.size();
@@ -137,6 +143,8 @@ void FairOrder::charge(Duration time)
     lane.together =
         time < longTogether ? std::min(2 * lane.together, mostTogether) : std::max<std::size_t>(lane.together / 2, 1);
     lane.release();
+    if (lane.workload)
+        lane.workload->took(time);
     shares_.charge(time, !lane.items.empty() && !lane.isPausing);
 }
 

@@ -4,6 +4,7 @@
 // (see FairShares).
 #pragma once
 
+#include "ledger/Workload.h"
 #include "platform/WorkQueue.h"
 #include "platform/linux/queues/FairShares.h"
 
@@ -37,6 +38,8 @@ public:
     [[nodiscard]] static bool isFull(Lane& lane, std::size_t heldBytes);
     static void setRoomHandler(Lane& lane, std::shared_ptr<const RoomHandler> handler);
     static void setReleaseHandler(Lane& lane, ReleaseHandler handler);
+    // The time of the lane's items counts there, too.
+    static void setWorkload(Lane& lane, std::shared_ptr<ledger::Workload> workload);
 
     // The lane's items no longer wait, until `resume` makes this item its first. The lane must be the one that is being
     // served, and its item must have come alone.

@@ -53,6 +53,12 @@ public:
         FairOrder::setRoomHandler(lane, std::make_shared<const FairOrder::RoomHandler>(std::move(handler)));
     }
 
+    void setWorkload(FairOrder::Lane& lane, std::shared_ptr<ledger::Workload> workload)
+    {
+        const foundation::Lock lock(lock_);
+        FairOrder::setWorkload(lane, std::move(workload));
+    }
+
     void pause(FairOrder::Lane& lane)
     {
         assert(isCurrent());
@@ -310,6 +316,10 @@ public:
         work_->setReleaseHandler(*lane_, std::move(handler));
     }
     void setRoomHandler(std::function<void()> handler) override { work_->setRoomHandler(*lane_, std::move(handler)); }
+    void setWorkload(std::shared_ptr<ledger::Workload> workload) override
+    {
+        work_->setWorkload(*lane_, std::move(workload));
+    }
     [[nodiscard]] Resume pause() override
     {
         work_->pause(*lane_);

@@ -217,7 +217,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheLaneIsFullAndNoPauseIsCounted)
     const auto lane = queue->makeLane(0);
     beforeResuming = [&, isFirst = true](Connection& connection) mutable {
         if (std::exchange(isFirst, false))
-            connection.setLane(lane);
+            connection.setLane(lane, ledger.workloads().open(connection.userIdentifier()));
     };
     std::atomic<std::uint64_t> submitted = 0;
     std::atomic<std::uint64_t> ran = 0;

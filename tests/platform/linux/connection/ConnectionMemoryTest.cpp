@@ -30,7 +30,7 @@ protected:
         beforeResuming = [this](Connection& connection) {
             const auto lane = queue->makeLane(connection.userIdentifier());
             progress.change([&] { lanes.push_back(lane); });
-            connection.setLane(lane);
+            connection.setLane(lane, ledger.workloads().open(connection.userIdentifier()));
         };
         handler = [this](ConnectionRecord& record, Connection::Call& call) {
             lanes[static_cast<std::size_t>(

@@ -286,6 +286,20 @@ TEST_F(FairOrderTest, ReleasesWhatItemsHoldWhenAllThatCameTogetherHaveRun)
     EXPECT_THAT(released, ElementsAre(10, 20));
 }
 
+TEST_F(FairOrderTest, CountsTheTimeOfALaneInItsWorkload)
+{
+    ledger::Workloads workloads;
+    const auto workload = workloads.open(alice);
+    const Lane lane = order.makeLane(alice);
+    const Lane other = order.makeLane(bob);
+    FairOrder::setWorkload(*lane, workload);
+    addMany(lane, "a", 2);
+    addMany(other, "b", 2);
+    for (int time = 0; time < 4; ++time)
+        serve(3ms);
+    EXPECT_EQ(workload->work(), (ledger::Work{.calls = 0, .time = 6ms, .bytes = 0}));
+}
+
 TEST_F(FairOrderTest, ReleasesAtOnceWhatItemsHeldThatHaveRunAlready)
 {
     const Lane lane = order.makeLane(alice);

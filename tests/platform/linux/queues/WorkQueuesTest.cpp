@@ -440,6 +440,24 @@ TEST_F(LanesTest, AnItemOfALaneIsCurrentOnItsQueue)
     EXPECT_TRUE(isCurrent);
 }
 
+TEST_F(LanesTest, TheTimeThatItsItemsTakeCountsInALanesWorkload)
+{
+    ledger::Workloads workloads;
+    const auto busy = workloads.open(1000);
+    const auto idle = workloads.open(1000);
+    const auto lane = queue->makeLane(1000);
+    const auto other = queue->makeLane(1000);
+    lane->setWorkload(busy);
+    other->setWorkload(idle);
+    const auto begin = std::chrono::steady_clock::now();
+    for (int item = 0; item < 3; ++item)
+        submit(*lane, "a", 5ms);
+    queue.reset();
+    EXPECT_GE(busy->work().time, 15ms);
+    EXPECT_LE(busy->work().time, std::chrono::steady_clock::now() - begin);
+    EXPECT_EQ(idle->work().time, 0ms);
+}
+
 TEST_F(LanesTest, AFullLaneSaysOnceWhenItHasRoomAgain)
 {
     const auto lane = queue->makeLane(1000);

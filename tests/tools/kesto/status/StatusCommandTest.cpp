@@ -7,6 +7,7 @@
 #include "tools/kesto/Tool.h"
 
 #include <algorithm>
+#include <chrono>
 #include <cmath>
 #include <filesystem>
 #include <fstream>
@@ -131,6 +132,26 @@ TEST_F(StatusCommand, OfAHealthyServiceEndsWith0AndHasAllNumbersAsJson)
     EXPECT_EQ(status["calls"]["sendMessage"].GetUint64(), 3U);
     EXPECT_EQ(status["calls"]["status"].GetUint64(), 1U);
     EXPECT_TRUE(status["who"]["lost"].Empty());
+}
+
+TEST_F(StatusCommand, SaysWhoTookTheTime)
+{
+    const auto begin = std::chrono::steady_clock::now();
+    kestod.startAndAwait();
+    const auto client = use();
+    const auto all = std::chrono::steady_clock::now() - begin;
+    const auto status = json(0);
+    const auto& works = status["sinceStart"]["who"]["time"];
+    const auto* const found = std::ranges::find_if(
+        works.Begin(), works.End(), [](const auto& work) { return work["process"] == "kesto_tool_test"; });
+    ASSERT_NE(found, works.End());
+    const auto& work = *found;
+    EXPECT_EQ(work["user"].GetUint64(), ::geteuid());
+    EXPECT_EQ(work["calls"].GetUint64(), 6U);
+    EXPECT_EQ(work["bytes"].GetUint64(), 69U) << "3 calls of 8 and 3 of 15 bytes";
+    EXPECT_GT(work["microseconds"].GetUint64(), 0U);
+    EXPECT_LE(std::chrono::microseconds(work["microseconds"].GetUint64()), all);
+    EXPECT_THAT(tool.run({"status"}).output, HasSubstr("    69 B  kesto_tool_test\n"));
 }
 
 TEST_F(StatusCommand, AfterALossEndsWith1AndSaysWhyAndWhatToDo)

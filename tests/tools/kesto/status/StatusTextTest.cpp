@@ -86,6 +86,27 @@ TEST_F(StatusText, NamesTheCulpritsItKnows)
                           "removed         1000                 5  player           org.example\n"));
 }
 
+TEST_F(StatusText, NamesThoseWhoTakeTheTimeAndSumsUpTheOthers)
+{
+    using namespace std::chrono_literals;
+    std::vector<std::shared_ptr<ledger::Workload>> workloads;
+    for (std::uint32_t user = 1000; user <= 1010; ++user) {
+        workloads.push_back(ledger->workloads().open(user));
+        ledger->workloads().setProcess(*workloads.back(), "player\n" + std::to_string(user));
+        workloads.back()->received(1'204, 35'200'000);
+        workloads.back()->took(1s * (1011 - user) + 26ms);
+    }
+    const std::string text = statusText(running(true), std::string::npos);
+    EXPECT_THAT(text,
+                HasSubstr("\n"
+                          "    TIME TAKEN        USER             CALLS    RECEIVED  PROCESS, SINCE START\n"
+                          "      11.026 s        1000             1,204     35.2 MB  player?1000\n"));
+    EXPECT_THAT(text,
+                testing::EndsWith("       2.026 s        1009             1,204     35.2 MB  player?1009\n"
+                                  "       1.026 s           -             1,204     35.2 MB  all others\n"));
+    EXPECT_THAT(statusText(running(), std::string::npos), Not(HasSubstr("TIME TAKEN")));
+}
+
 TEST_F(StatusText, SaysThatTheServiceDoesNotRun)
 {
     const std::string text = statusText(ledger::report(*accountIn(image), false), std::string::npos);
