@@ -333,6 +333,7 @@ public:
             return std::unexpected(CborError::TrailingBytes);
         return value;
     }
+    [[nodiscard]] std::size_t heads() const noexcept { return heads_; }
 
 private:
     void fail(CborError error) noexcept
@@ -367,6 +368,7 @@ private:
 
     Head readHead() noexcept
     {
+        ++heads_;
         if (rest_.empty()) {
             fail(CborError::Truncated);
             return {};
@@ -534,13 +536,18 @@ private:
     std::string_view rest_;
     CborDecoder& decoder_;
     std::optional<CborError> error_;
+    std::size_t heads_ = 0; // that were read
     std::string chunks_;
     std::vector<Value>& values_ = unfinishedValues();
 };
 
 std::expected<Value, CborError> CborDecoder::decode(std::string_view bytes, unsigned maximumDepth)
 {
-    return CborReader(bytes, *this).readAll(maximumDepth);
+    constexpr std::size_t bytesOfAnItem = 64; // with its object, besides its text
+    CborReader reader(bytes, *this);
+    auto value = reader.readAll(maximumDepth);
+    mostMemory_ = bytes.size() + reader.heads() * bytesOfAnItem;
+    return value;
 }
 
 namespace {

@@ -63,6 +63,8 @@ public:
     // Decodes the bytes, which hold exactly one item with at most so many nested containers.
     [[nodiscard]] std::expected<Value, CborError> decode(std::string_view bytes,
                                                          unsigned maximumDepth = cborMaximumDepth);
+    // Not less than the memory (`Value::roughBytes`) of the value that was decoded last, and far less work to know.
+    [[nodiscard]] std::size_t mostMemory() const noexcept { return mostMemory_; }
 
 private:
     friend class CborReader;
@@ -77,6 +79,7 @@ private:
     static constexpr std::size_t longestRememberedKey = 64;
     static constexpr std::size_t rememberedKeys = 256;
     static constexpr std::size_t rememberedShapes = 16;
+    std::size_t mostMemory_ = 0;
     std::vector<String> keys_; // by a hash of their characters; a new key replaces the one at its place
     std::array<Reference<DictionaryShape>, rememberedShapes> shapes_; // by a hash, too
 };

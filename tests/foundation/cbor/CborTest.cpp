@@ -32,6 +32,7 @@ RC_GTEST_PROP(CborProperty, WhatIsWrittenIsReadBackByteForByte, ())
     RC_ASSERT(read.has_value());
     RC_ASSERT(*read == value);
     RC_ASSERT(encoded(*read) == bytes); // equality forgives the kind of a number; this does not
+    RC_ASSERT(decoder.mostMemory() >= read->roughBytes());
 }
 
 RC_GTEST_PROP(CborProperty, AnythingAtAllIsReadOrRefused, (const std::string& bytes))
@@ -274,6 +275,18 @@ TEST(Cbor, ADecoderGoesOnAfterAnError)
     CborDecoder decoder;
     EXPECT_FALSE(decoder.decode("\x7F\x61\x61"));
     EXPECT_EQ(*decoder.decode(fromHex("7f6162ff")), Value("b"));
+}
+
+TEST(Cbor, ADecoderKnowsHowMuchMemoryAValueTakesAtMost)
+{
+    CborDecoder decoder;
+    EXPECT_TRUE(decoder.decode(encoded(Dictionary{{"a", 1}})));
+    EXPECT_EQ(decoder.mostMemory(), 196U) << "4 bytes and 3 items of 64";
+    const std::vector<Value> empty(1000, Value(Array()));
+    const auto list = decoder.decode(encoded(Array(empty)));
+    ASSERT_TRUE(list);
+    EXPECT_EQ(decoder.mostMemory(), 65'067U) << "1,003 bytes and 1,001 items of 64";
+    EXPECT_EQ(list->roughBytes(), 64'064U);
 }
 
 } // namespace

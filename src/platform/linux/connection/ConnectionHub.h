@@ -47,6 +47,7 @@ struct ConnectionHub {
     // Room for one read of one connection, used by the connection thread.
     std::array<char, mostReadAtOnce> readBuffer = {};
     std::vector<Connection::Call> calls = {};
+    std::size_t bytesOfCalls = 0; // memory of these
 };
 
 } // namespace platform

@@ -20,7 +20,7 @@ std::expected<std::optional<ConnectionInput::Frame>, ConnectionInput::Refusal> C
     auto array = value->array();
     if (!array)
         return std::unexpected(Refusal{"a frame is not an array", FramesNotCbor});
-    return Frame{*std::move(array), (*frame)->size()};
+    return Frame{*std::move(array), (*frame)->size(), decoder_.mostMemory()};
 }
 
 } // namespace platform

@@ -20,6 +20,7 @@ public:
     struct Frame {
         foundation::Array array;
         std::size_t size; // of its encoding
+        std::size_t memory; // that the array takes at most
     };
 
     // What is wrong with a frame, and where it is counted.

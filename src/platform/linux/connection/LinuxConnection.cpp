@@ -227,7 +227,7 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
         }
         if (!*frame)
             return {};
-        auto& [array, size] = **frame;
+        auto& [array, size, memory] = **frame;
         if (const std::string_view request = requestName(array);
             request == emitterAccessRequest || request == statusRequest) {
             auto asked = request == statusRequest ? askForStatus(array[0], size) : askForEmitterAccess(array[0]);
@@ -239,6 +239,7 @@ std::expected<void, Connection::Violation> LinuxConnection::decodeFrames()
         }
         unanswered_.fetch_add(unansweredCall(size));
         std::shared_ptr<Connection> caller(std::make_shared<Credit>(shared_from_this(), size), this);
+        hub_->bytesOfCalls += memory;
         hub_->calls.push_back({std::move(array), std::move(caller)});
     }
 }
@@ -256,9 +257,7 @@ void LinuxConnection::countPart()
 
 std::expected<void, Connection::Violation> LinuxConnection::deliverCalls()
 {
-    std::size_t held = 0;
-    for (const Call& call : hub_->calls)
-        held += foundation::Value(call.frame).roughBytes();
+    const std::size_t held = std::exchange(hub_->bytesOfCalls, 0);
     hub_->transit.add(*share_, held);
     const CallScope scope(*this);
     std::expected<void, Violation> result;

@@ -29,7 +29,7 @@ bool fellTo(std::size_t mark, std::size_t before, std::size_t after) noexcept
     return before > mark && after <= mark;
 }
 
-void updateFullness(TransitMemory::Holder& holder, std::size_t limit) noexcept
+void compare(TransitMemory::Holder& holder, std::size_t limit) noexcept
 {
     holder.isFull = holder.bytes > (holder.isFull ? lowMark(limit) : highMark(limit));
 }
@@ -79,12 +79,15 @@ void TransitMemory::remove(Share& share, std::size_t bytes) noexcept
         wake_();
 }
 
+// Nothing counts as long as all clients read what they get, and then there is nothing to compare.
 bool TransitMemory::hasRoomForReading(Share& share)
 {
+    if (all_.bytes == 0)
+        return true;
     const MemoryLimits limits = limits_();
-    platform::updateFullness(all_, limits.ofTheService);
-    platform::updateFullness(*share.user, limits.ofAUser);
-    platform::updateFullness(share, limits.ofAClient);
+    compare(all_, limits.ofTheService);
+    compare(*share.user, limits.ofAUser);
+    compare(share, limits.ofAClient);
     return !all_.isFull && !share.user->isFull && !share.isFull;
 }
 
