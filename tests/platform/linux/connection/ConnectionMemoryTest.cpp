@@ -172,7 +172,7 @@ TEST_F(ConnectionMemory, TheClientWithTheMostUnreadAnswersEndsWhenOneMoreDoesNot
 
 TEST_F(ConnectionMemory, AClientEndsItselfWhenItAloneHasTooManyUnreadAnswers)
 {
-    listenWithin({.ofTheService = 16'000'000, .ofAUser = 8'000'000, .ofAClient = 2'000'000});
+    listenWithin({.ofTheService = 16'000'000, .ofAUser = 2'500'000, .ofAClient = 2'000'000});
     SocketClient client(path);
     ConnectionRecord& record = connected();
     for (int answer = 1; answer <= 4; ++answer)
