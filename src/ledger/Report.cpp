@@ -87,6 +87,7 @@ Value work(Dictionary::Entries whose, const Work& work)
 Array workByWhom(const WorkByWhom& byWhom)
 {
     std::vector<Value> list;
+    list.reserve(byWhom.largest.size() + 1);
     for (const auto& [user, process, each] : byWhom.largest)
         list.push_back(work({{"user", user}, {"process", process}}, each));
     if (byWhom.others != Work())
