@@ -26,10 +26,10 @@ using Entry = WorkByWhom::Entry;
 
 class WorkloadTest : public testing::Test {
 protected:
-    std::shared_ptr<Workload> begin(std::uint32_t user, const std::string& process, const Work& work)
+    std::shared_ptr<Workload> begin(std::uint32_t user, const std::string& name, const Work& work)
     {
         auto workload = workloads.open(user);
-        workloads.setProcess(*workload, process);
+        workloads.setProcess(*workload, name);
         workload->received(work.calls, work.bytes);
         workload->took(work.time);
         return workload;
