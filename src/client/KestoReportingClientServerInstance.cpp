@@ -320,27 +320,36 @@ void KestoReportingClientServerInstance::reporterID(std::int64_t reporterID, Dic
 void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
 {
     submitLong([reply = std::move(reply)](auto& self, platform::Turn& turn) {
-        if (self.isConnectionLost_) // the calls that it left waiting must not delay others
-            return;
-        struct Collected {
-            KestoReportingServiceDelegateProtocol::Clients clients;
-            std::size_t next = 0;
-            std::vector<foundation::Value> reporterIDs = {};
-        };
-        const auto delegate = self.delegate_.lock();
-        const auto all =
-            std::make_shared<Collected>(delegate ? delegate->getAllClients() : decltype(Collected::clients)());
-        const auto collectNext = [all](auto&, platform::Turn&) {
-            if (all->next == all->clients.size())
-                return false;
-            for (const auto& entry : all->clients[all->next++]->clientReportingSessionMap())
-                all->reporterIDs.emplace_back(entry.reporterID);
-            return true;
-        };
-        self.inSlices(turn, collectNext, [all, reply](auto& client, platform::Turn& last) {
-            if (!client.isConnectionLost_)
-                reply(last, std::nullopt, std::move(all->reporterIDs));
+        self.whenAlone(turn, [reply](auto& client, platform::Turn& later, auto place) {
+            client.collectReporters(later, reply, std::move(place));
         });
+    });
+}
+
+void KestoReportingClientServerInstance::collectReporters(platform::Turn& turn, const ArrayReply& reply,
+                                                          client::LongCalls::Place place)
+{
+    if (isConnectionLost_) // the calls that it left waiting must not delay others
+        return;
+    struct Collected {
+        client::LongCalls::Place place;
+        KestoReportingServiceDelegateProtocol::Clients clients;
+        std::size_t next = 0;
+        std::vector<foundation::Value> reporterIDs = {};
+    };
+    const auto delegate = delegate_.lock();
+    const auto all = std::make_shared<Collected>(std::move(place),
+                                                 delegate ? delegate->getAllClients() : decltype(Collected::clients)());
+    const auto collectNext = [all](auto&, platform::Turn&) {
+        if (all->next == all->clients.size())
+            return false;
+        for (const auto& entry : all->clients[all->next++]->clientReportingSessionMap())
+            all->reporterIDs.emplace_back(entry.reporterID);
+        return true;
+    };
+    inSlices(turn, collectNext, [all, reply](auto& self, platform::Turn& last) {
+        if (!self.isConnectionLost_)
+            reply(last, std::nullopt, std::move(all->reporterIDs));
     });
 }
 

@@ -100,6 +100,7 @@ private:
         std::size_t next = 0; // in the one list or the other
         std::size_t room = 0; // for further receivers of the IDs
         std::size_t refused = 0;
+        client::LongCalls::Place place = nullptr; // if it takes long
 
         [[nodiscard]] bool mayTakeLong() const;
     };
@@ -130,6 +131,20 @@ private:
                 work(*self, later, moment);
             });
         });
+    }
+    // Calls `work(*this, turn, place)` when no other long call of this user is under way; until the place is let go of,
+    // none is. This client's next calls wait. For an item of `submitLong`, as its last step.
+    template <typename Work> void whenAlone(platform::Turn& turn, Work work)
+    {
+        const auto delegate = delegate_.lock();
+        const auto calls = delegate ? delegate->longCalls() : nullptr;
+        if (!calls)
+            return work(*this, turn, nullptr);
+        calls->begin(turn, userIdentifier_, *queue_,
+                     [self = shared_from_this(), work = std::move(work)](platform::Turn& later,
+                                                                         client::LongCalls::Place place) mutable {
+                         work(*self, later, std::move(place));
+                     });
     }
     // Calls `step(*this, turn)` until it returns false, and then `then(*this, turn)`. If this takes long, other
     // clients' calls run in between; this client's next calls wait. For an item of `submitLong`, as its last step.
@@ -163,6 +178,7 @@ private:
     void completeStop(platform::Turn& turn, const Session& session);
     void stopAll(platform::Turn& turn, const std::shared_ptr<std::vector<Session>>& sessions);
     void leave(platform::Turn& turn);
+    void collectReporters(platform::Turn& turn, const ArrayReply& reply, client::LongCalls::Place place);
     void deliver(platform::Turn& turn, Delivery delivery);
     void beginDelivery(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery);
     bool deliverToNext(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery);

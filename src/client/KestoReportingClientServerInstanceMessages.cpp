@@ -29,14 +29,16 @@ void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary mess
                                   std::move(processName).value_or("(null)"), source_},
                       .reporterIDs = std::move(reporterIDs),
                       .reply = std::move(reply)};
-    const bool mayTakeLong = delivery.mayTakeLong();
-    auto work = [delivery = std::move(delivery)](auto& self, platform::Turn& turn) mutable {
-        self.deliver(turn, std::move(delivery));
-    };
-    if (mayTakeLong)
-        submitLong(std::move(work));
-    else
-        submit(std::move(work));
+    if (!delivery.mayTakeLong())
+        return submit([delivery = std::move(delivery)](auto& self, platform::Turn& turn) mutable {
+            self.deliver(turn, std::move(delivery));
+        });
+    submitLong([delivery = std::move(delivery)](auto& self, platform::Turn& turn) mutable {
+        self.whenAlone(turn, [delivery = std::move(delivery)](auto& client, platform::Turn& later, auto place) mutable {
+            delivery.place = std::move(place);
+            client.deliver(later, std::move(delivery));
+        });
+    });
 }
 
 bool KestoReportingClientServerInstance::Delivery::mayTakeLong() const

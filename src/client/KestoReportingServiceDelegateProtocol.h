@@ -2,6 +2,7 @@
 #pragma once
 
 #include "client/ListAllowance.h"
+#include "client/LongCalls.h"
 #include "client/SessionEnds.h"
 #include "foundation/values/Value.h"
 #include "session/KestoReportingSession.h"
@@ -44,6 +45,8 @@ public:
     // Reports to the session how the drivers' channels changed since the session's snapshot.
     virtual void sendDriverLogsForSession(platform::Turn& turn, const std::shared_ptr<KestoReportingSession>& session,
                                           const session::DriverMoment& moment) = 0;
+    // Those of all clients.
+    [[nodiscard]] virtual std::shared_ptr<client::LongCalls> longCalls() = 0;
     // What stops the sessions of all clients.
     [[nodiscard]] virtual std::shared_ptr<client::SessionEnds> sessionEnds() = 0;
     virtual void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) = 0;

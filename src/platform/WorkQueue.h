@@ -70,7 +70,7 @@ class Lane : public TurnQueue {
 public:
     // Whether so many items wait that the submitter should pause. After it returned true, the room handler is called
     // once when few are left. What was submitted since the last call holds so many bytes: the release handler gets them
-    // once, when all of it has run.
+    // once, when all of it has run. An item that pauses the lane has run when the one that continues it has.
     [[nodiscard]] virtual bool isFull(std::size_t heldBytes) = 0;
     // The thread that runs the items calls the handlers; the release handler also the one that calls `isFull`, and
     // under the queue's lock, so that it must not use the queue. Set both before `isFull` is called.

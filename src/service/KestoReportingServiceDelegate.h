@@ -63,6 +63,7 @@ public:
     void handleEventForVorp(const foundation::Dictionary& message, AudioEventCategory category, std::uint16_t type,
                             const std::shared_ptr<KestoReportingSession>& session,
                             const std::string& processName) override;
+    [[nodiscard]] std::shared_ptr<client::LongCalls> longCalls() override { return longCalls_; }
     [[nodiscard]] std::shared_ptr<client::SessionEnds> sessionEnds() override { return sessionEnds_; }
     void removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client) override;
     [[nodiscard]] std::int64_t activeSessionCount() const override { return activeSessionCount_; }
@@ -97,6 +98,7 @@ private:
     std::atomic<std::int64_t> activeSessionCount_{0};
     Clients clients_;
     std::unique_ptr<KestoReportingDriverUtility> driverUtility_;
+    const std::shared_ptr<client::LongCalls> longCalls_ = std::make_shared<client::LongCalls>();
     const std::shared_ptr<client::SessionEnds> sessionEnds_ = std::make_shared<client::SessionEnds>();
     const foundation::Dictionary defaults_;
     std::unique_ptr<KestoReportingUtilityVorpStateManager> vorpStateManager_; // on internal builds only

@@ -361,6 +361,26 @@ TEST_F(ManyReceiversTest, LetTheCallsOfOthersGoInBetween)
     EXPECT_EQ(platform.ledger.account()[ledger::Counter::Recorded], 2U * sessions);
 }
 
+// So the service remembers the sessions that a message has yet to reach once for each user, not for each connection.
+TEST_F(ManyReceiversTest, GetTheMessagesOfAUserOneAfterTheOther)
+{
+    TestClient stranger = harness.connect("stranger", 77);
+    const auto first = player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    const auto second = recorder.submit(SendMessage, {Dictionary{{"b", 1}}, 4, 1, null});
+    const auto third = recorder.submit(GetAllReporters, {});
+    const auto ofAnother = stranger.submit(SendMessage, {Dictionary{{"c", 1}}, 4, 1, allIDs()});
+    const auto recordedSoFar = [&] { return platform.ledger.account()[ledger::Counter::Recorded]; };
+    while (player.answersTo(first) == unanswered)
+        ASSERT_TRUE(platform.workQueues.runOne());
+    EXPECT_GT(recordedSoFar(), 25U) << "that of another user goes in between";
+    EXPECT_LE(recordedSoFar(), 40U) << "the second has not begun";
+    platform.workQueues.runAll();
+    EXPECT_EQ(recorder.answersTo(second), answeredOnce(delivered));
+    EXPECT_EQ(stranger.answersTo(ofAnother), answeredOnce(delivered));
+    EXPECT_NE(recorder.answersTo(third), unanswered);
+    EXPECT_EQ(recordedSoFar(), 3U * sessions);
+}
+
 TEST_F(ManyReceiversTest, AreReachedTogetherWhileItIsQuick)
 {
     platform.traceEmitter.setObserver(nullptr);
@@ -497,6 +517,7 @@ public:
     MOCK_METHOD(void, sendDriverLogsForSession,
                 (platform::Turn&, const std::shared_ptr<KestoReportingSession>&, const session::DriverMoment&),
                 (override));
+    MOCK_METHOD(std::shared_ptr<client::LongCalls>, longCalls, (), (override));
     MOCK_METHOD(std::shared_ptr<client::SessionEnds>, sessionEnds, (), (override));
     MOCK_METHOD(void, removeClient, (const std::shared_ptr<KestoReportingClientServerInstance>&), (override));
     MOCK_METHOD(void, handleEventForVorp,

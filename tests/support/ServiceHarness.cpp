@@ -51,11 +51,11 @@ ServiceHarness::ServiceHarness(const std::function<void(TestPlatform&)>& prepare
     forget();
 }
 
-TestClient ServiceHarness::connect(std::string processName)
+TestClient ServiceHarness::connect(std::string processName, std::uint32_t user)
 {
     const std::int32_t processIdentifier = nextPID_++;
     platform.processTable.add(processIdentifier, std::move(processName));
-    auto connection = listener.connect(processIdentifier);
+    auto connection = listener.connect(processIdentifier, user);
     platform.workQueues.runAll();
     forget();
     return {platform.workQueues, std::move(connection), service->getAllClients().back()};

@@ -110,7 +110,7 @@ public:
     explicit ServiceHarness(const std::function<void(TestPlatform&)>& prepare = {});
 
     // A new process connects and is registered. Clears the log and the trace of it.
-    TestClient connect(std::string processName = "player");
+    TestClient connect(std::string processName = "player", std::uint32_t user = 0);
     // Forgets the log and the trace so far.
     void forget();
     // Finds a session in the service, as the delivery of a message does.

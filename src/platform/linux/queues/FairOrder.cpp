@@ -110,7 +110,7 @@ void FairOrder::setWorkload(Lane& lane, std::shared_ptr<ledger::Workload> worklo
 
 void FairOrder::Lane::release()
 {
-    const std::uint64_t ran = added - items.size();
+    const std::uint64_t ran = added - items.size() - (isPausing ? 1 : 0); // the item that paused goes on
     for (; !batches.empty() && batches.front().end <= ran; batches.pop_front())
         if (releaseHandler)
             releaseHandler(batches.front().bytes);

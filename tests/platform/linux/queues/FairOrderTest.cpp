@@ -327,5 +327,20 @@ TEST_F(FairOrderTest, DoesNotReleaseWhatItemsHoldBehindAPause)
     EXPECT_THAT(released, ElementsAre(10));
 }
 
+TEST_F(FairOrderTest, DoesNotReleaseWhatAPausingItemHoldsBeforeItsEnd)
+{
+    const Lane lane = order.makeLane(alice);
+    std::vector<std::size_t> released;
+    FairOrder::setReleaseHandler(*lane, [&](std::size_t bytes) { released.push_back(bytes); });
+    order.add(lane, {[&](Turn&) { order.pause(*lane); }, true});
+    EXPECT_FALSE(FairOrder::isFull(*lane, 10));
+    EXPECT_THAT(serve(1ms), IsEmpty());
+    EXPECT_THAT(released, IsEmpty());
+    order.resume(lane, {[](Turn&) { }, true});
+    EXPECT_THAT(released, IsEmpty());
+    EXPECT_THAT(serve(1ms), IsEmpty());
+    EXPECT_THAT(released, ElementsAre(10));
+}
+
 } // namespace
 } // namespace platform
