@@ -21,10 +21,33 @@ void SessionEnds::stop(platform::Turn& turn, std::shared_ptr<KestoReportingSessi
         session.reset(); // `then` may be what lets go of it
         return then(turn);
     }
+    if (!session->hasManyMessages())
+        return writeFile(turn, std::move(session), lane, std::move(then));
     auto run = session->beginStop();
     ends_.push_back({std::move(session), std::move(run), lane, std::move(then), lane->pause()});
     if (ends_.size() == 1)
         begin(ends_.front());
+}
+
+// The file of a short session. Its other steps are quick, so it waits for no end of a long one.
+void SessionEnds::writeFile(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session,
+                            const std::shared_ptr<platform::Lane>& lane, Then then)
+{
+    auto run = session->beginStop();
+    run->makeVolumeEvents();
+    while (run->hasVolumeEvents())
+        run->sendVolumeEvent(turn, session);
+    elsewhere(
+        [run = std::move(run), session = std::move(session), then = std::move(then), resume = lane->pause()]() mutable {
+            run->summarise();
+            run->letGo();
+            resume([run = std::move(run), session = std::move(session),
+                    then = std::move(then)](platform::Turn& last) mutable {
+                session->finishStop(last, *run);
+                session.reset(); // before `then` may let go of it
+                then(last);
+            });
+        });
 }
 
 void SessionEnds::begin(End& end)

@@ -34,6 +34,8 @@ private:
         platform::Lane::Resume resume;
     };
 
+    void writeFile(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session,
+                   const std::shared_ptr<platform::Lane>& lane, Then then);
     void begin(End& end);
     void sendVolumeEvents(platform::Turn& turn, End& end);
     void summarise(End& end);

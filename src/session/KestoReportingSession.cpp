@@ -243,17 +243,20 @@ std::unique_ptr<session::RunEnd> KestoReportingSession::makeRunEnd() const
                                              run());
 }
 
-// What ends sooner than another thread is woken, ends here. Ordinary messages of so many bytes take 0.1 ms, and those
-// with as many different keys as there is room for, 2 ms. A file always takes long.
 bool KestoReportingSession::takesLongToStop() const
+{
+    const auto run = this->run();
+    return run && !run->store().empty() && (hasManyMessages() || KestoReportingUtilityIsInternalBuild());
+}
+
+// What ends sooner than another thread is woken, is not many. Ordinary messages of so many bytes take 0.1 ms, and those
+// with as many different keys as there is room for, 2 ms.
+bool KestoReportingSession::hasManyMessages() const
 {
     constexpr std::size_t fewMessages = 512;
     constexpr std::size_t fewBytes = std::size_t{48} << 10;
     const auto run = this->run();
-    if (!run || run->store().empty())
-        return false;
-    const session::MessageStore& store = run->store();
-    return store.size() > fewMessages || store.bytes() > fewBytes || KestoReportingUtilityIsInternalBuild();
+    return run && (run->store().size() > fewMessages || run->store().bytes() > fewBytes);
 }
 
 void KestoReportingSession::letGoOfMessages()

@@ -78,6 +78,8 @@ public:
     void stop(platform::Turn& turn);
     // Whether that would take so long that other clients should not wait for it.
     [[nodiscard]] bool takesLongToStop() const;
+    // Whether that is because of the messages, and not only of the file that is written.
+    [[nodiscard]] bool hasManyMessages() const;
     // The same as a stop, in two parts, for a session that is started. The first takes the run out of the session,
     // which is stopped from then on; the caller carries out the steps of its end, and then calls the second. Nothing
     // may start the session in between.

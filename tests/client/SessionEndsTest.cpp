@@ -335,6 +335,13 @@ protected:
                                    {"kestoreporting_timestamp", 10 * change}},
                         4, 1, Array{reporterID});
     }
+    // So many that not only the file goes aside.
+    static void addManyMessages(TestClient& client, std::int64_t reporterID)
+    {
+        constexpr int many = 513;
+        for (int number = 0; number < many; ++number)
+            client.call(SendMessage, Dictionary{{"n", number}}, 4, 1, Array{reporterID});
+    }
 };
 
 TEST_F(InternalSessionEndsTest, KeepTheOrderOfAStop)
@@ -362,6 +369,7 @@ TEST_F(InternalSessionEndsTest, KeepTheOrderOfAStop)
 TEST_F(InternalSessionEndsTest, SendVolumeEventsInSlices)
 {
     playAtThreeVolumes(player, 42);
+    addManyMessages(player, 42);
     platform.analytics.clear();
     submitStop(player, 42);
     std::vector<std::size_t> sent; // before each answer
@@ -388,6 +396,23 @@ TEST_F(InternalSessionEndsTest, SendVolumeEventsTogetherWhileItIsQuick)
     EXPECT_THAT(platform.analytics.payloads("com.quarn.kesto.Volume.Summary"), SizeIs(3));
 }
 
+TEST_F(InternalSessionEndsTest, KeepTheOrderOfALongStopToo)
+{
+    playAtThreeVolumes(player, 42);
+    addManyMessages(player, 42);
+    std::vector<std::string> steps;
+    platform.log.setObserver([&](const LogLine& line) {
+        if (line.level != Debug)
+            steps.push_back(line.message.substr(0, line.message.find_first_of(":,0123456789")));
+    });
+    EXPECT_EQ(player.call(StopReportingSessionForID, 42), answeredOnce(succeeded));
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(steps,
+                ElementsAre("sending volume event for reporter ", "jsonOutput writeToURL",
+                            "sending summary event for reporter ", "sessions for client ", "sessions for client ", "",
+                            "stopping "));
+}
+
 TEST_F(InternalSessionEndsTest, GoAsideForEveryFile)
 {
     playAtThreeVolumes(player, 42);
@@ -403,6 +428,8 @@ TEST_F(InternalSessionEndsTest, NeedTheMemoryOfAnEndOnlyOnce)
 {
     playAtThreeVolumes(player, 42);
     playAtThreeVolumes(recorder, 43);
+    addManyMessages(player, 42);
+    addManyMessages(recorder, 43);
     int analysed = 0;
     int summarised = 0;
     int most = 0;
