@@ -4,11 +4,11 @@
 namespace utility {
 
 // Logs what was lost: the events whose loss the log does not show yet, and in one line all that was lost since the
-// start. Waits for no disk, but for the log, at most a second. Any thread.
+// start. Waits until the log is written, at most a second. Any thread.
 void reportLosses();
 
 // Reports the losses, and ends the process with that status immediately, because other threads are running: nothing is
-// destroyed, and only the log may wait for a disk. Acknowledged events are kept already. Any thread.
+// destroyed. It waits for the log as above. Acknowledged events are kept already. Any thread.
 [[noreturn]] void endProcess(int status);
 
 } // namespace utility

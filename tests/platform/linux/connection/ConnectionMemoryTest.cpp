@@ -191,7 +191,7 @@ TEST_F(ConnectionMemory, AnotherUserIsServedWhileOneHasUsedUpItsPart)
 {
     if (::geteuid() != 0)
         GTEST_SKIP() << "only root can be another user";
-    constexpr uid_t nobody = 65534;
+    constexpr uid_t otherUser = 65534;
     listenWithin(small);
     std::filesystem::permissions(directory.path(), std::filesystem::perms::all);
     std::filesystem::permissions(path, std::filesystem::perms::all);
@@ -199,10 +199,10 @@ TEST_F(ConnectionMemory, AnotherUserIsServedWhileOneHasUsedUpItsPart)
     fill(greedy);
     greedy.write(callNumber(11, 10'000));
     ASSERT_TRUE(waitForCount(Counter::MemoryPauses, 1));
-    ASSERT_EQ(::seteuid(nobody), 0);
+    ASSERT_EQ(::seteuid(otherUser), 0);
     SocketClient other(path);
     ASSERT_EQ(::seteuid(0), 0);
-    EXPECT_EQ(connected().connection->userIdentifier(), nobody);
+    EXPECT_EQ(connected().connection->userIdentifier(), otherUser);
     for (int number = 1; number <= 5; ++number)
         other.write(callNumber(number, 10'000));
     EXPECT_TRUE(waitForCounter(delivered, 15));
