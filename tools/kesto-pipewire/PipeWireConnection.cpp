@@ -9,6 +9,7 @@
 #include <pipewire/keys.h>
 #include <pipewire/link.h>
 #include <pipewire/node.h>
+#include <pipewire/port.h>
 #include <pipewire/proxy.h>
 #include <pipewire/type.h>
 #include <spa/utils/string.h>
@@ -92,9 +93,11 @@ private:
     static constexpr pw_client_events events{PW_VERSION_CLIENT_EVENTS, hearInfo, nullptr};
 };
 
+// A filter has no parameters of a stream: its ports have formats of their own, and it has no volume.
 class BoundStream : public PipeWireConnection::Bound {
 public:
-    BoundStream(PipeWireConnection& connection, ObjectID id)
+    enum class Kind : std::uint8_t { Stream, Filter };
+    BoundStream(PipeWireConnection& connection, ObjectID id, Kind kind)
         : Bound(connection, id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE)
     {
         if (!proxy_)
@@ -102,7 +105,8 @@ public:
         auto* node = reinterpret_cast<pw_node*>(proxy_);
         std::array<std::uint32_t, 2> followed{SPA_PARAM_Props, SPA_PARAM_Format};
         pw_node_add_listener(node, &hook_, &events, this);
-        pw_node_subscribe_params(node, followed.data(), followed.size());
+        if (kind == Kind::Stream)
+            pw_node_subscribe_params(node, followed.data(), followed.size());
     }
 
 private:
@@ -110,9 +114,11 @@ private:
     {
         auto* self = static_cast<BoundStream*>(data);
         const auto now = currentMoment();
-        if (info->props)
+        if (info->props) {
+            self->graph().setLinkGroup(self->id_, textOf(*info->props, PW_KEY_NODE_LINK_GROUP), now);
             self->graph().describeNode(self->id_, identityOf(*info->props), textOf(*info->props, PW_KEY_MEDIA_ROLE),
                                        now);
+        }
         self->graph().setRunning(self->id_, info->state == PW_NODE_STATE_RUNNING, now);
         self->connection_.followProfiler();
     }
@@ -138,14 +144,20 @@ public:
     BoundDevice(PipeWireConnection& connection, ObjectID id)
         : Bound(connection, id, PW_TYPE_INTERFACE_Node, PW_VERSION_NODE)
     {
-        if (proxy_)
-            pw_node_add_listener(reinterpret_cast<pw_node*>(proxy_), &hook_, &events, this);
+        if (!proxy_)
+            return;
+        auto* node = reinterpret_cast<pw_node*>(proxy_);
+        std::array<std::uint32_t, 1> followed{SPA_PARAM_Format};
+        pw_node_add_listener(node, &hook_, &events, this);
+        pw_node_subscribe_params(node, followed.data(), followed.size());
     }
 
 private:
     static void hearInfo(void* data, const pw_node_info* info)
     {
         auto* self = static_cast<BoundDevice*>(data);
+        if (info->props)
+            self->graph().setLinkGroup(self->id_, textOf(*info->props, PW_KEY_NODE_LINK_GROUP), currentMoment());
         if (const auto state = stateOf(info->state))
             self->graph().setDeviceState(self->id_, *state, currentMoment());
     }
@@ -162,7 +174,14 @@ private:
         return std::nullopt;
     }
 
-    static constexpr pw_node_events events{PW_VERSION_NODE_EVENTS, hearInfo, nullptr};
+    static void hearParameter(void* data, int, std::uint32_t kind, std::uint32_t, std::uint32_t, const spa_pod* value)
+    {
+        auto* self = static_cast<BoundDevice*>(data);
+        if (const auto rate = value && kind == SPA_PARAM_Format ? readRate(*value) : std::nullopt)
+            self->graph().setDeviceRate(self->id_, *rate, currentMoment());
+    }
+
+    static constexpr pw_node_events events{PW_VERSION_NODE_EVENTS, hearInfo, hearParameter};
 };
 
 class BoundProfiler : public PipeWireConnection::Bound {
@@ -253,14 +272,33 @@ void PipeWireConnection::objectAppeared(ObjectID id, std::string_view type, cons
     } else if (type == PW_TYPE_INTERFACE_Client) {
         bound_[id] = std::make_unique<BoundClient>(*this, id);
     } else if (type == PW_TYPE_INTERFACE_Link) {
-        const auto output = numberOf<ObjectID>(properties, PW_KEY_LINK_OUTPUT_NODE);
-        const auto input = numberOf<ObjectID>(properties, PW_KEY_LINK_INPUT_NODE);
-        if (output && input)
-            graph_.addLink(id, *output, *input, currentMoment());
+        linkAppeared(id, properties);
+    } else if (type == PW_TYPE_INTERFACE_Port) {
+        const auto format = textOf(properties, PW_KEY_FORMAT_DSP);
+        const bool isSound = format.empty() || format == "32 bit float mono audio";
+        if (!isSound || textOf(properties, PW_KEY_PORT_MONITOR) == "true")
+            graph_.addPortWithoutSound(id);
     } else if (type == PW_TYPE_INTERFACE_Profiler) {
         profilerID_ = id;
         followProfiler();
     }
+}
+
+void PipeWireConnection::linkAppeared(ObjectID id, const spa_dict& properties)
+{
+    const auto output = numberOf<ObjectID>(properties, PW_KEY_LINK_OUTPUT_NODE);
+    const auto input = numberOf<ObjectID>(properties, PW_KEY_LINK_INPUT_NODE);
+    if (!output || !input)
+        return;
+    const LinkEnds ends{
+        .outputNode = *output,
+        .inputNode = *input,
+        .outputPort = numberOf<ObjectID>(properties, PW_KEY_LINK_OUTPUT_PORT).value_or(PW_ID_ANY),
+        .inputPort = numberOf<ObjectID>(properties, PW_KEY_LINK_INPUT_PORT).value_or(PW_ID_ANY),
+    };
+    if (const auto filter = graph_.addLink(id, ends, currentMoment()))
+        bound_[*filter] = std::make_unique<BoundStream>(*this, *filter, BoundStream::Kind::Filter);
+    followProfiler();
 }
 
 void PipeWireConnection::nodeAppeared(ObjectID id, const spa_dict& properties)
@@ -272,7 +310,9 @@ void PipeWireConnection::nodeAppeared(ObjectID id, const spa_dict& properties)
         .client = numberOf<ObjectID>(properties, PW_KEY_CLIENT_ID),
     };
     switch (graph_.addNode(id, node)) {
-    case Graph::Interest::Stream: bound_[id] = std::make_unique<BoundStream>(*this, id); break;
+    case Graph::Interest::Stream:
+        bound_[id] = std::make_unique<BoundStream>(*this, id, BoundStream::Kind::Stream);
+        break;
     case Graph::Interest::Device: bound_[id] = std::make_unique<BoundDevice>(*this, id); break;
     case Graph::Interest::None: break;
     }

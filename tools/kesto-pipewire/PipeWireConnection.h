@@ -1,7 +1,8 @@
 // One connection to a PipeWire server: its events, decoded and fed into a graph of streams.
 //
-// It only observes. It binds clients (for their identity), streams (for their state, volume and format), devices (for
-// their state) and, while a stream runs, the profiler (for cycles); the registry itself reports links.
+// It only observes. It binds clients (for their identity), streams (for their state, volume and format), filters from
+// their first link with a device on (for their state), devices (for their state and rate) and, while a stream runs, the
+// profiler (for cycles); the registry itself reports links.
 #pragma once
 
 #include "kesto-pipewire/Graph.h"
@@ -40,6 +41,7 @@ private:
 
     void objectAppeared(ObjectID id, std::string_view type, const spa_dict& properties);
     void objectRemoved(ObjectID id);
+    void linkAppeared(ObjectID id, const spa_dict& properties);
     void nodeAppeared(ObjectID id, const spa_dict& properties);
     void failed(ObjectID id, int error);
 

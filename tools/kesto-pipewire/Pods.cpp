@@ -185,6 +185,12 @@ std::optional<StreamFormat> readFormat(const spa_pod& format)
     return result;
 }
 
+std::optional<std::int32_t> readRate(const spa_pod& format)
+{
+    const bool isAudio = spa_pod_is_object(&format) && readID(format, SPA_FORMAT_mediaType) == SPA_MEDIA_TYPE_audio;
+    return isAudio ? readInteger(format, SPA_FORMAT_AUDIO_rate) : std::nullopt;
+}
+
 void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& handle)
 {
     if (!spa_pod_is_struct(&profile))

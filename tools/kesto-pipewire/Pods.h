@@ -23,6 +23,9 @@ namespace kesto_pipewire {
 // The audio format, or nothing if the value holds none, as for a suspended stream. Any thread.
 [[nodiscard]] std::optional<StreamFormat> readFormat(const spa_pod& format);
 
+// An audio format's rate in frames a second, or nothing if it has none. Any thread.
+[[nodiscard]] std::optional<std::int32_t> readRate(const spa_pod& format);
+
 // Calls back for every cycle that the profiler reports. A record without a new signal for the driver, which comes when
 // a driver starts after a pause or a cycle was missed, is not a cycle. Any thread.
 void readCycles(const spa_pod& profile, const std::function<void(const Cycle&)>& handle);

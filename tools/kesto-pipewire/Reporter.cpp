@@ -124,7 +124,20 @@ void Reporter::formatChanged(StreamSerial serial, const StreamFormat& format, Mo
 
 void Reporter::devicesChanged(StreamSerial serial, const std::string& devices, Moment when)
 {
-    update(serial, when, [&](Stream& stream) { stream.devices.observe(devices, when); });
+    update(serial, when, [&](Stream& stream) {
+        if (devices.empty() && stream.description.isFilter)
+            settleLostFilter(stream);
+        stream.devices.observe(devices, when);
+    });
+}
+
+// A filter loses its links one by one, and the last one now. It has played with all its channels until then.
+void Reporter::settleLostFilter(Stream& stream)
+{
+    if (stream.running.current && !stream.running.reported)
+        reportChanges(stream, infinity); // even the shortest run is reported, with its devices
+    if (stream.runs > 0)
+        stream.format.current = stream.format.reported;
 }
 
 void Reporter::cycleWasLate(StreamSerial serial, Moment when)
@@ -167,9 +180,14 @@ Reporter::Changes Reporter::changesOf(const Stream& stream)
     };
     const auto& [running, volume, format, devices] =
         std::tie(stream.running, stream.volume, stream.format, stream.devices);
-    const auto startsAtOnce = running.current && (stream.runs > 0 || stream.isKnownWhole());
-    add(running, &Reporter::reportRunning, running.changedAt,
-        running.changedAt.uptime + (startsAtOnce ? 0 : settlingTime));
+    const auto startsAtOnce =
+        running.current && (stream.runs > 0 || (stream.isKnownWhole() && !stream.description.isFilter));
+    const auto addRunning = [&] {
+        add(stream.running, &Reporter::reportRunning, stream.running.changedAt,
+            stream.running.changedAt.uptime + (startsAtOnce ? 0 : settlingTime));
+    };
+    if (!running.current || stream.runs == 0)
+        addRunning();
     if (stream.runs == 0)
         return changes; // the first Start reports the others
 
@@ -177,6 +195,8 @@ Reporter::Changes Reporter::changesOf(const Stream& stream)
         std::max(volume.changedAt.uptime, volume.reportedSince.uptime + volumeInterval));
     add(format, &Reporter::reportFormat, format.changedAt, format.changedAt.uptime + settlingTime);
     add(devices, &Reporter::reportDevices, devices.changedAt, devices.changedAt.uptime + settlingTime);
+    if (running.current)
+        addRunning(); // a filter runs from the moment of its link: with the device, not before it
     return changes;
 }
 
@@ -293,6 +313,7 @@ void Reporter::send(const Stream& stream, Category category, EventType type, Pay
 {
     if (!serviceIsThere_)
         return;
+    message.emplace_back("stream", stream.description.name);
     message.emplace_back("kestoreporting_timestamp", when.secondsSince1970);
     message.emplace_back("systemuptime_sec", std::int64_t{std::llround(when.uptime)});
     service_.send(stream.session, category, type, message);

@@ -117,6 +117,7 @@ private:
     template <typename Action> void update(StreamSerial serial, Moment when, Action action);
     void setAlarm();
 
+    void settleLostFilter(Stream& stream);
     void reportDue(Stream& stream, Moment now);
     void reportChanges(Stream& stream, double dueUntil);
     void reportRunning(Stream& stream, Moment when);

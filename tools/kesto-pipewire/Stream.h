@@ -1,7 +1,7 @@
 // A stream as plain data, and the interface that reports changes of streams.
 //
-// A stream is one player's or recorder's connection to PipeWire. These types separate the code for PipeWire from the
-// code for the reporting service: neither includes the other.
+// A stream is one player's or recorder's connection to PipeWire, or one direction of a filter's. These types separate
+// the code for PipeWire from the code for the reporting service: neither includes the other.
 #pragma once
 
 #include "kesto-pipewire/Moment.h"
@@ -21,6 +21,8 @@ struct StreamDescription {
     Direction direction = Direction::Output;
     std::string role{}; // PipeWire's `media.role`, such as "Music"; may be empty
     std::string application{}; // the player or recorder; may be empty
+    std::string name{}; // tells it from the other streams of its application
+    bool isFilter = false; // its channels are its links, which come and go one by one
 };
 
 struct StreamFormat {

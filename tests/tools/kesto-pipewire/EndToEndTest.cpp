@@ -265,9 +265,47 @@ TEST_F(EndToEndTest, TwoStreamsAtOnceDoNotMix)
     ASSERT_TRUE(comes("nonlongformaudio.Volume.Summary"));
 
     EXPECT_THAT(values("longformaudio.Volume.Summary", "HostApplicationDisplayID"), ElementsAre("pacat"));
+    EXPECT_THAT(values("longformaudio.Playback.Start", "stream"), ElementsAre(testing::StartsWith("pacat#")));
     EXPECT_THAT(values("longformaudio.Volume.Summary", "PomoSessionVolume"), ElementsAre("0.5"));
     EXPECT_THAT(values("nonlongformaudio.Volume.Summary", "HostApplicationDisplayID"), ElementsAre("tone-player"));
     EXPECT_THAT(values("nonlongformaudio.Volume.Summary", "PomoSessionVolume"), ElementsAre("1"));
+}
+
+TEST_F(EndToEndTest, AFilterThatPlaysTwoSecondsBecomesTheseEvents)
+{
+    const auto filter = server.runFilter(2, 0);
+    const auto bracket = [](auto act) {
+        const auto before = std::chrono::steady_clock::now();
+        act();
+        return Bracket{before, std::chrono::steady_clock::now()};
+    };
+    const auto start = bracket([&] {
+        server.link("tone-filter:output_1", "null-sink:playback_FL");
+        server.link("tone-filter:output_2", "null-sink:playback_FR");
+        ASSERT_TRUE(comes("kesto.Playback.Start"));
+    });
+    letItPlay(2000ms);
+    const auto end = bracket([&] {
+        filter->kill(SIGKILL);
+        ASSERT_TRUE(comes("kesto.Playback.Deactivate"));
+    });
+    ASSERT_TRUE(comes("kesto.Volume.Summary"));
+
+    EXPECT_THAT(events(), testing::IsSupersetOf({"Playback.Start", "Playback.Stop", "Playback.Deactivate"}));
+    for (const auto* event : {"generic.Playback.Start", "generic.Playback.Stop"}) {
+        EXPECT_THAT(values(event, "active_devices"), ElementsAre("null-sink"));
+        EXPECT_THAT(values(event, "session_selected_format"), testing::Each(testing::StartsWith("F32P/48000/")));
+        EXPECT_THAT(values(event, "PomoSessionVolume"), ElementsAre("1"));
+        EXPECT_THAT(values(event, "HostApplicationDisplayID"), ElementsAre("tone-filter"));
+        EXPECT_THAT(values(event, "stream"), ElementsAre(testing::MatchesRegex("tone-filter#[0-9]+")));
+    }
+    EXPECT_THAT(values("generic.Playback.Stop", "session_selected_format"), ElementsAre("F32P/48000/2"));
+    EXPECT_THAT(values("generic.Playback.Stop", "mChannelsPerFrame"), ElementsAre("2"));
+    EXPECT_THAT(values("kesto.Volume.Summary", "active_devices"), testing::Each("null-sink"));
+    double seconds = 0;
+    for (const auto& length : values("kesto.Volume.Summary", "play_seconds"))
+        seconds += std::stod(length);
+    expectDuration(std::to_string(seconds), start, end);
 }
 
 TEST_F(EndToEndTest, ASessionsEndTellsWhatTheDevicesDid)

@@ -63,8 +63,8 @@ TEST_F(GraphTest, ADevicesStateAndLinksAreReported)
     addStream(node, 500);
     devices.news();
     graph.setDeviceState(sink, DeviceState::Idle, now);
-    graph.addLink(50, node, sink, now);
-    graph.addLink(51, node, sink, now);
+    graph.addLink(50, {node, sink}, now);
+    graph.addLink(51, {node, sink}, now);
     graph.setDeviceState(sink, DeviceState::Running, now);
     graph.remove(50, now);
     graph.remove(51, now);
@@ -212,6 +212,328 @@ TEST_F(GraphCyclesTest, ARunningDeviceThatGoesDoesNotCountAsAStreamThatEnds)
     EXPECT_FALSE(graph.anyStreamRuns());
 }
 
+// ---- Filters ----
+
+constexpr StreamSerial recordingMark = 0x8000'0000'0000'0000;
+
+class GraphFilterTest : public GraphTest {
+protected:
+    GraphFilterTest()
+    {
+        EXPECT_EQ(add(31, 31, "microphone", "Audio/Source"), Interest::Device);
+        EXPECT_EQ(add(node, 500, "ardour", ""), Interest::None);
+        graph.setDeviceRate(sink, 48000, now);
+    }
+    // The node's ports are 101, 102, ... for output and 201, 202, ... for input.
+    std::optional<ObjectID> play(ObjectID id, ObjectID port, ObjectID device = sink)
+    {
+        return graph.addLink(id, {node, device, port, 1000 + id}, now);
+    }
+    std::optional<ObjectID> record(ObjectID id, ObjectID port, ObjectID device = 31)
+    {
+        return graph.addLink(id, {device, node, 1000 + id, port}, now);
+    }
+    void describeAndRun()
+    {
+        graph.describeNode(node, {.name = "Ardour"}, "DSP", now);
+        graph.setRunning(node, true, now);
+    }
+    void playOnTwoPorts()
+    {
+        play(50, 101);
+        play(51, 102);
+        describeAndRun();
+        listener.news();
+    }
+    static std::string recording(std::string_view what) { return fmt::format("{} {}", 500 + recordingMark, what); }
+};
+
+TEST_F(GraphFilterTest, AFilterIsFollowedFromItsFirstLinkWithADeviceOn)
+{
+    describeAndRun();
+    EXPECT_THAT(listener.news(), IsEmpty()) << "it is not followed yet";
+    EXPECT_EQ(play(50, 101), node);
+    EXPECT_EQ(play(51, 102), std::nullopt);
+    EXPECT_THAT(listener.news(), IsEmpty()) << "it is not described yet";
+    describeAndRun();
+
+    EXPECT_THAT(listener.news(),
+                ElementsAre("500 appeared output role=DSP application=Ardour", "500 volume 1", "500 devices 'speaker'",
+                            "500 format F32P/48000/2 2", "500 devices 'speaker'", "500 format F32P/48000/2 2",
+                            "500 runs"));
+    EXPECT_EQ(listener.descriptions.at(0).name, "ardour#500");
+    EXPECT_TRUE(listener.descriptions.at(0).isFilter);
+    EXPECT_TRUE(graph.anyStreamRuns());
+}
+
+TEST_F(GraphFilterTest, ItPlaysWhileItRunsAndIsLinkedWithASink)
+{
+    playOnTwoPorts();
+    graph.remove(50, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'", "500 format F32P/48000/1 1"));
+    graph.remove(51, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices ''", "500 halts"));
+    EXPECT_FALSE(graph.anyStreamRuns());
+    play(52, 101);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'", "500 format F32P/48000/1 1", "500 runs"));
+    graph.setRunning(node, false, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'", "500 format F32P/48000/1 1", "500 halts"));
+    graph.remove(node, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 gone"));
+}
+
+TEST_F(GraphFilterTest, APortThatIsLinkedWithTwoDevicesIsOneChannel)
+{
+    EXPECT_EQ(add(32, 32, "headset", "Audio/Sink"), Interest::Device);
+    play(50, 101);
+    play(51, 101, 32);
+    graph.describeNode(node, {}, "", now);
+
+    EXPECT_THAT(listener.news(), testing::IsSupersetOf({"500 devices 'headset,speaker'", "500 format F32P/48000/1 1"}));
+}
+
+TEST_F(GraphFilterTest, OneThatPlaysAndRecordsIsTwoStreams)
+{
+    graph.setDeviceRate(31, 44100, now);
+    play(50, 101);
+    record(51, 201);
+    record(52, 202);
+    describeAndRun();
+
+    EXPECT_THAT(listener.news(),
+                testing::IsSupersetOf({std::string("500 appeared output role=DSP application=Ardour"),
+                                       std::string("500 devices 'speaker'"), std::string("500 format F32P/48000/1 1"),
+                                       std::string("500 runs"), recording("appeared input role=DSP application=Ardour"),
+                                       recording("devices 'microphone'"), recording("format F32P/44100/2 2"),
+                                       recording("runs")}));
+    EXPECT_EQ(listener.descriptions.at(0).name, "ardour#500");
+    EXPECT_EQ(listener.descriptions.at(1).name, "ardour#500.input");
+    graph.remove(50, now);
+    EXPECT_THAT(listener.news(),
+                testing::AllOf(testing::Contains("500 halts"), testing::Not(testing::Contains(recording("halts")))));
+    graph.remove(node, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 gone", recording("gone")));
+    EXPECT_FALSE(graph.anyStreamRuns());
+}
+
+TEST_F(GraphFilterTest, OnlyLinksThatPlayOrRecordOnADeviceCount)
+{
+    EXPECT_EQ(add(41, 501, "other filter", ""), Interest::None);
+    EXPECT_EQ(add(42, 502, "Midi-Bridge", "Midi/Bridge"), Interest::None);
+    EXPECT_EQ(add(43, 503, "duplex", "Audio/Duplex"), Interest::Device);
+    addStream(44, 504);
+    EXPECT_EQ(play(50, 101, 41), std::nullopt);
+    EXPECT_EQ(record(51, 201, 41), std::nullopt);
+    EXPECT_EQ(play(52, 101, 42), std::nullopt);
+    EXPECT_EQ(record(53, 201, 44), std::nullopt);
+    EXPECT_EQ(record(54, 201, sink), std::nullopt) << "a sink's monitor";
+    EXPECT_EQ(play(55, 101, 31), std::nullopt);
+    graph.addPortWithoutSound(1056); // of the device
+    EXPECT_EQ(record(56, 201, 43), std::nullopt) << "a monitor";
+    graph.addPortWithoutSound(109);
+    EXPECT_EQ(play(57, 109), std::nullopt) << "MIDI";
+    graph.addPortWithoutSound(1058);
+    EXPECT_EQ(play(58, 101), std::nullopt) << "MIDI at the device";
+    graph.remove(109, now);
+    EXPECT_EQ(play(59, 109), node) << "another port with this ID";
+    describeAndRun();
+    EXPECT_THAT(listener.news(), testing::IsSupersetOf({"500 devices 'speaker'", "500 format F32P/48000/1 1"}));
+    EXPECT_EQ(listener.descriptions.size(), 2u) << "with the player";
+}
+
+TEST_F(GraphFilterTest, ADuplexDeviceIsBoth)
+{
+    EXPECT_EQ(add(43, 503, "duplex", "Audio/Duplex"), Interest::Device);
+    play(50, 101, 43);
+    record(51, 201, 43);
+    describeAndRun();
+
+    EXPECT_THAT(listener.news(),
+                testing::IsSupersetOf({std::string("500 devices 'duplex'"), recording("devices 'duplex'")}));
+}
+
+TEST_F(GraphFilterTest, TheFormatFollowsTheRateOfTheDevice)
+{
+    play(50, 101);
+    record(51, 201);
+    describeAndRun();
+    EXPECT_THAT(listener.news(), testing::Not(testing::Contains(testing::StartsWith(recording("format")))))
+        << "the microphone's rate is not known";
+    graph.setDeviceRate(sink, 44100, now);
+    EXPECT_THAT(listener.news(), testing::Contains("500 format F32P/44100/1 1"));
+    graph.setDeviceRate(sink, 44100, now);
+    EXPECT_THAT(listener.news(), IsEmpty());
+    graph.setDeviceRate(31, 96000, now);
+    EXPECT_THAT(listener.news(), testing::Contains(recording("format F32P/96000/1 1")));
+}
+
+TEST_F(GraphFilterTest, FiltersAndStreamsHaveOneLimit)
+{
+    for (ObjectID id = 0; id < maximumStreams - 1; ++id)
+        ASSERT_EQ(add(1000 + id, 1000 + id), Interest::Stream);
+    ASSERT_EQ(add(41, 501, "another", ""), Interest::None);
+    EXPECT_EQ(play(50, 101), node);
+    EXPECT_EQ(graph.addLink(51, {41, sink, 301, 1051}, now), std::nullopt);
+    EXPECT_EQ(graph.ignoredObjects(), 1u);
+    graph.describeNode(41, {}, "", now);
+    EXPECT_THAT(listener.news(), IsEmpty());
+    EXPECT_EQ(add(42, 502), Interest::None);
+    graph.remove(node, now);
+
+    EXPECT_EQ(graph.addLink(52, {41, sink, 302, 1052}, now), 41);
+}
+
+TEST_F(GraphFilterTest, AFilterThatIsLateIsLateInEachDirection)
+{
+    play(50, 101);
+    record(51, 201);
+    describeAndRun();
+    listener.news();
+    const Cycle cycle{.began = 10'500'000'000, .followers = {{.node = node, .isLate = true}}};
+    graph.noteCycle(cycle);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 late", recording("late")));
+}
+
+TEST_F(GraphFilterTest, PortsHaveALimit)
+{
+    for (ObjectID id = 0; id < maximumObjects + 3; ++id)
+        graph.addPortWithoutSound(100'000 + id);
+
+    EXPECT_EQ(graph.ignoredObjects(), 3u);
+}
+
+// ---- Chains ----
+
+class GraphChainTest : public GraphTest {
+protected:
+    // A virtual sink and its stream, whose link with the speaker is 60.
+    void addSinkChain()
+    {
+        ASSERT_EQ(add(61, 601, "chain-input", "Audio/Sink"), Interest::Device);
+        ASSERT_EQ(add(62, 602, "chain-output"), Interest::Stream);
+        graph.setLinkGroup(sink, "", now);
+        graph.setLinkGroup(61, "chain-1", now);
+        graph.setLinkGroup(62, "chain-1", now);
+        graph.describeNode(62, {.name = "chain"}, "", now);
+        graph.setRunning(62, true, now);
+    }
+};
+
+TEST_F(GraphChainTest, WhatPlaysOnAVirtualSinkPlaysOnTheDevicesOfItsStream)
+{
+    addSinkChain();
+    graph.addLink(60, {62, sink}, now);
+    addStream(node, 500);
+    graph.addLink(link, {node, 61}, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'"));
+    ASSERT_EQ(add(31, 31, "headset", "Audio/Sink"), Interest::Device);
+    graph.addLink(63, {62, 31}, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'headset,speaker'"));
+    graph.remove(60, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'headset'"));
+    graph.remove(63, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices ''"));
+}
+
+TEST_F(GraphChainTest, TheStreamOfAChainIsNotReported)
+{
+    addSinkChain();
+    graph.addLink(60, {62, sink}, now);
+    graph.setVolume(62, 0.5, now);
+    graph.setRunning(62, false, now);
+    graph.remove(61, now);
+    graph.addLink(63, {62, sink}, now);
+    graph.remove(60, now);
+    graph.remove(62, now);
+
+    EXPECT_THAT(listener.news(), IsEmpty());
+}
+
+TEST_F(GraphChainTest, AnObserverThatComesLateLearnsOfTheChainInAnyOrder)
+{
+    ASSERT_EQ(add(62, 602, "chain-output"), Interest::Stream);
+    ASSERT_EQ(add(61, 601, "chain-input", "Audio/Sink"), Interest::Device);
+    addStream(node, 500);
+    graph.addLink(60, {62, sink}, now);
+    graph.addLink(link, {node, 61}, now);
+    graph.setLinkGroup(62, "chain-1", now);
+    graph.describeNode(62, {.name = "chain"}, "", now);
+    graph.setLinkGroup(sink, "", now);
+    listener.news();
+    graph.setLinkGroup(61, "chain-1", now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'"));
+}
+
+TEST_F(GraphChainTest, WhatRecordsFromAVirtualSourceRecordsFromTheDevicesOfItsStream)
+{
+    ASSERT_EQ(add(31, 31, "microphone", "Audio/Source"), Interest::Device);
+    ASSERT_EQ(add(61, 601, "chain-output", "Audio/Source"), Interest::Device);
+    ASSERT_EQ(add(62, 602, "chain-input", "Stream/Input/Audio"), Interest::Stream);
+    for (const ObjectID device : {sink, ObjectID{31}})
+        graph.setLinkGroup(device, "", now);
+    graph.setLinkGroup(61, "chain-1", now);
+    graph.setLinkGroup(62, "chain-1", now);
+    graph.describeNode(62, {}, "", now);
+    graph.addLink(60, {31, 62}, now);
+    addStream(node, 500, "recorder", "Stream/Input/Audio");
+    graph.addLink(link, {61, node}, now);
+
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'microphone'"));
+}
+
+TEST_F(GraphChainTest, MembersOfALinkGroupWithoutADeviceAreStreams)
+{
+    ASSERT_EQ(add(62, 602, "loopback"), Interest::Stream);
+    graph.setLinkGroup(62, "loopback-1", now);
+    graph.describeNode(62, {}, "", now);
+    graph.setVolume(62, 0.5, now);
+    graph.setFormat(62, {"F32P/48000/2", 2}, now);
+    graph.setRunning(62, true, now);
+    graph.addLink(60, {62, sink}, now);
+    EXPECT_THAT(listener.news(), IsEmpty()) << "the sink could be of this group";
+    graph.setLinkGroup(sink, "", now);
+
+    EXPECT_THAT(listener.news(),
+                ElementsAre("602 appeared output role= application=", "602 volume 0.5", "602 format F32P/48000/2 2",
+                            "602 devices 'speaker'", "602 runs"));
+}
+
+TEST_F(GraphChainTest, ChainsMayBeLinkedInARing)
+{
+    addSinkChain();
+    ASSERT_EQ(add(71, 701, "second-input", "Audio/Sink"), Interest::Device);
+    ASSERT_EQ(add(72, 702, "second-output"), Interest::Stream);
+    graph.setLinkGroup(71, "chain-2", now);
+    graph.setLinkGroup(72, "chain-2", now);
+    graph.describeNode(72, {}, "", now);
+    addStream(node, 500);
+    graph.addLink(link, {node, 61}, now);
+    graph.addLink(73, {62, 71}, now);
+    listener.news();
+    graph.addLink(74, {72, sink}, now);
+    EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'")) << "through both";
+    graph.addLink(75, {72, 61}, now);
+
+    EXPECT_THAT(listener.news(), testing::Each("500 devices 'speaker'"));
+}
+
+TEST_F(GraphTest, AStreamsNameHasItsNodesNameAndItsNumber)
+{
+    addStream(40, 500, "player");
+    addStream(41, 501, "player");
+    addStream(42, 502, "");
+    addStream(43, 503, std::string(300, 'x'));
+
+    EXPECT_EQ(listener.descriptions[0].name, "player#500");
+    EXPECT_EQ(listener.descriptions[1].name, "player#501");
+    EXPECT_EQ(listener.descriptions[2].name, "unnamed#502");
+    EXPECT_EQ(listener.descriptions[3].name, std::string(251, 'x') + "#503");
+    EXPECT_FALSE(listener.descriptions[0].isFilter);
+}
+
 // ---- Limits and other nodes ----
 
 TEST_F(GraphTest, DevicesBeyondTheLimitKeepTheirNamesOnly)
@@ -221,7 +543,7 @@ TEST_F(GraphTest, DevicesBeyondTheLimitKeepTheirNamesOnly)
     EXPECT_EQ(add(31, 31, "headset", "Audio/Sink"), Interest::None);
     EXPECT_EQ(graph.ignoredObjects(), 1u);
     addStream(node, 500);
-    graph.addLink(link, node, 31, now);
+    graph.addLink(link, {node, 31}, now);
     EXPECT_THAT(listener.news(), ElementsAre("500 devices 'headset'"));
     graph.remove(1001, now);
 
@@ -276,9 +598,9 @@ TEST_F(GraphTest, DevicesAreNamedOnceHoweverManyLinksThereAre)
 {
     addStream(node, 500);
     EXPECT_EQ(add(31, 31, "another", "Audio/Sink"), Interest::Device);
-    graph.addLink(50, node, sink, now);
-    graph.addLink(51, node, sink, now);
-    graph.addLink(52, node, 31, now);
+    graph.addLink(50, {node, sink}, now);
+    graph.addLink(51, {node, sink}, now);
+    graph.addLink(52, {node, 31}, now);
     EXPECT_THAT(listener.news(),
                 ElementsAre("500 devices 'speaker'", "500 devices 'speaker'", "500 devices 'another,speaker'"));
     graph.remove(50, now);
@@ -290,7 +612,7 @@ TEST_F(GraphTest, DevicesAreNamedOnceHoweverManyLinksThereAre)
 TEST_F(GraphTest, AnInputHasTheDeviceAtTheOtherEnd)
 {
     addStream(node, 500, "recorder", "Stream/Input/Audio");
-    graph.addLink(link, sink, node, now);
+    graph.addLink(link, {sink, node}, now);
 
     EXPECT_THAT(listener.news(), ElementsAre("500 devices 'speaker'"));
 }
@@ -299,7 +621,7 @@ TEST_F(GraphTest, StreamsThatAreLinkedWithEachOtherAreEachOthersDevices)
 {
     addStream(40, 500, "player");
     addStream(41, 501, "recorder", "Stream/Input/Audio");
-    graph.addLink(link, 40, 41, now);
+    graph.addLink(link, {40, 41}, now);
 
     EXPECT_THAT(listener.news(), ElementsAre("500 devices 'recorder'", "501 devices 'player'"));
 }
@@ -307,7 +629,7 @@ TEST_F(GraphTest, StreamsThatAreLinkedWithEachOtherAreEachOthersDevices)
 TEST_F(GraphTest, WhoComesLateLearnsOfLinksThatAreThere)
 {
     ASSERT_EQ(add(node, 500), Interest::Stream);
-    graph.addLink(link, node, sink, now);
+    graph.addLink(link, {node, sink}, now);
     EXPECT_THAT(listener.news(), IsEmpty());
     graph.describeNode(node, {}, "", now);
 
@@ -318,9 +640,9 @@ TEST_F(GraphTest, WhatGoesBeforeItsLinksLetsGoOfTheirOtherEnds)
 {
     addStream(40, 500);
     addStream(41, 501, "monitor", "Stream/Input/Audio");
-    graph.addLink(50, 40, sink, now);
-    graph.addLink(51, 40, sink, now);
-    graph.addLink(52, sink, 41, now);
+    graph.addLink(50, {40, sink}, now);
+    graph.addLink(51, {40, sink}, now);
+    graph.addLink(52, {sink, 41}, now);
     listener.news();
     devices.news();
     graph.remove(40, now);
@@ -330,7 +652,7 @@ TEST_F(GraphTest, WhatGoesBeforeItsLinksLetsGoOfTheirOtherEnds)
     EXPECT_THAT(devices.news(), ElementsAre("30 unwanted"));
 
     addStream(42, 502);
-    graph.addLink(53, 42, sink, now);
+    graph.addLink(53, {42, sink}, now);
     listener.news();
     devices.news();
     graph.remove(sink, now);
@@ -344,7 +666,7 @@ TEST_F(GraphTest, AnIDThatIsUsedAgainIsAnotherStream)
 {
     addStream(node, 500);
     graph.setRunning(node, true, now);
-    graph.addLink(link, node, sink, now);
+    graph.addLink(link, {node, sink}, now);
     graph.remove(node, now); // before its link, which servers do not do
     listener.news();
     ASSERT_EQ(add(node, 501), Interest::Stream);
@@ -401,7 +723,7 @@ TEST_F(GraphTest, WhenTheServerGoesEveryStreamGoes)
     EXPECT_THAT(listener.news(), testing::UnorderedElementsAre("500 gone", "501 gone"));
     EXPECT_THAT(devices.news(), ElementsAre("30 output speaker", "30 gone"));
     EXPECT_FALSE(graph.anyStreamRuns());
-    graph.addLink(link, 40, 41, now);
+    graph.addLink(link, {40, 41}, now);
     graph.setRunning(41, true, now);
     EXPECT_THAT(listener.news(), IsEmpty());
 }
@@ -436,7 +758,7 @@ TEST_F(GraphTest, ObjectsOfEveryOtherKindHaveTheirLimitToo)
 {
     for (ObjectID id = 0; id < maximumObjects + 10; ++id) {
         EXPECT_EQ(add(100'000 + id, id, "device", "Audio/Card"), Interest::None);
-        graph.addLink(200'000 + id, sink, sink, now);
+        graph.addLink(200'000 + id, {sink, sink}, now);
         graph.describeClient(300'000 + id, {});
     }
 
@@ -447,7 +769,7 @@ TEST_F(GraphTest, ForeignTextIsMadeFitToBeSent)
 {
     EXPECT_EQ(add(31, 31, "bad\xFF\xFEnäme", "Audio/Sink"), Interest::Device);
     ASSERT_EQ(add(node, 500), Interest::Stream);
-    graph.addLink(link, node, 31, now);
+    graph.addLink(link, {node, 31}, now);
     graph.describeNode(node, {.binary = std::string(10'000, 'x')}, "", now);
     const auto heard = listener.news();
 

@@ -203,7 +203,7 @@ std::string HeadlessPipeWire::runToEnd(const std::vector<std::string>& arguments
     std::string output;
     for (auto line = program->readLine(); !line.empty(); line = program->readLine())
         output += line + "\n";
-    EXPECT_EQ(program->wait(), 0) << arguments[0] << " " << arguments[1];
+    EXPECT_EQ(program->wait(), 0) << arguments[0] << " " << arguments[1] << " said: " << output;
     return output;
 }
 
@@ -212,9 +212,38 @@ std::unique_ptr<Program> HeadlessPipeWire::playTone(const std::string& role) con
     return run({TONE_PLAYER, role});
 }
 
-std::unique_ptr<Program> HeadlessPipeWire::playOverPulse(const std::string& role) const
+std::unique_ptr<Program> HeadlessPipeWire::runFilter(int outputs, int inputs) const
 {
-    return run({"sh", "-c", "exec pacat --playback --raw --property=media.role=" + role + " </dev/zero"});
+    return run({TONE_FILTER, std::to_string(outputs), std::to_string(inputs)});
+}
+
+void HeadlessPipeWire::link(const std::string& output, const std::string& input) const
+{
+    runToEnd({"sh", "-c",
+              "for turn in $(seq 300); do said=$(pw-link \"$0\" \"$1\" 2>&1) && exit 0;"
+              " case $said in *exists) exit 0;; esac; sleep 0.01; done; echo \"$said: $0 $1\"; pw-link -io; exit 1",
+              output, input});
+}
+
+void HeadlessPipeWire::unlink(const std::string& output, const std::string& input) const
+{
+    runToEnd({"pw-link", "-d", output, input});
+}
+
+std::unique_ptr<Program> HeadlessPipeWire::runChain(const std::string& deviceClass) const
+{
+    const bool isSink = deviceClass == "Audio/Sink";
+    const auto properties = [&](const std::string& end, bool isDevice) {
+        return "--" + end + "-props={ node.name = chain-" + (end == "capture" ? "input" : "output")
+            + (isDevice ? " media.class = " + deviceClass : "") + (isSink ? " }" : " stream.capture.sink = true }");
+    };
+    return run({"pw-loopback", properties("capture", isSink), properties("playback", !isSink)});
+}
+
+std::unique_ptr<Program> HeadlessPipeWire::playOverPulse(const std::string& role, const std::string& device) const
+{
+    return run({"sh", "-c",
+                "exec pacat --playback --raw --device=" + device + " --property=media.role=" + role + " </dev/zero"});
 }
 
 std::unique_ptr<Program> HeadlessPipeWire::record() const

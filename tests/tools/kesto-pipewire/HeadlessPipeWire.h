@@ -63,7 +63,17 @@ public:
 
     // Players and recorders. The tone player obeys "pause\n" and "play\n".
     [[nodiscard]] std::unique_ptr<Program> playTone(const std::string& role) const;
-    [[nodiscard]] std::unique_ptr<Program> playOverPulse(const std::string& role) const;
+    // A program without links, whose ports are "tone-filter:output_1", "tone-filter:input_1" and so on.
+    [[nodiscard]] std::unique_ptr<Program> runFilter(int outputs, int inputs) const;
+    // Links two ports as soon as both exist, unless they are linked.
+    void link(const std::string& output, const std::string& input) const;
+    void unlink(const std::string& output, const std::string& input) const;
+    // A virtual device and the stream to which it passes its sound, in a program of their own: the sink
+    // "chain-input" with the stream "chain-output", which plays on a device, or the source "chain-output" with the
+    // stream "chain-input", which records from one.
+    [[nodiscard]] std::unique_ptr<Program> runChain(const std::string& deviceClass) const;
+    [[nodiscard]] std::unique_ptr<Program> playOverPulse(const std::string& role,
+                                                         const std::string& device = "@DEFAULT_SINK@") const;
     [[nodiscard]] std::unique_ptr<Program> record() const;
 
     // PulseAudio's number of the playing stream, by which `pactl` names it. Exactly one stream must play.

@@ -306,6 +306,105 @@ TEST_F(ObserverTest, AStreamWithoutADeviceDoesNotRun)
     EXPECT_TRUE(happens([this] { return first().devices == "null-sink" && first().runs; }));
 }
 
+// ---- Filters and chains ----
+
+TEST_F(ObserverTest, AFilterIsSeenFromItsFirstLinkWithADeviceOn)
+{
+    observer->start();
+    const auto filter = server.runFilter(2, 1);
+    server.link("null-sink:monitor_FL", "tone-filter:input_1");
+    server.link("tone-filter:midi", "null-sink:playback_FL");
+    const auto player = server.playTone("Music");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    EXPECT_EQ(first().description.application, "tone-player") << "neither a monitor nor MIDI counts";
+    server.link("tone-filter:output_1", "null-sink:playback_FL");
+    server.link("tone-filter:output_2", "null-sink:playback_FR");
+    ASSERT_TRUE(happens([this] { return plays(1) && seen.streams[1].format->channels == 2; }));
+
+    const auto& stream = seen.streams[1];
+    EXPECT_EQ(stream.description.direction, Direction::Output);
+    EXPECT_EQ(stream.description.application, "tone-filter");
+    EXPECT_THAT(stream.description.name, testing::MatchesRegex("tone-filter#[0-9]+"));
+    EXPECT_EQ(stream.format, (StreamFormat{"F32P/48000/2", 2}));
+    EXPECT_EQ(stream.volume, 1);
+    EXPECT_EQ(stream.devices, "null-sink");
+    filter->kill(SIGKILL);
+    EXPECT_TRUE(happens([this] { return seen.streams[1].isGone; }));
+    EXPECT_EQ(seen.streams.size(), 2u);
+}
+
+TEST_F(ObserverTest, WhoComesLateSeesAFilterThatPlays)
+{
+    const auto filter = server.runFilter(1, 0);
+    server.link("tone-filter:output_1", "null-sink:playback_FL");
+    observer->start();
+
+    EXPECT_TRUE(happens([this] { return plays(0) && first().format->text == "F32P/48000/1"; }));
+}
+
+TEST_F(ObserverTest, AFilterPlaysWhileItIsLinked)
+{
+    observer->start();
+    const auto filter = server.runFilter(1, 0);
+    server.link("tone-filter:output_1", "null-sink:playback_FL");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+    server.unlink("tone-filter:output_1", "null-sink:playback_FL");
+    ASSERT_TRUE(happens([this] { return !first().runs && first().devices.empty(); }));
+    server.link("tone-filter:output_1", "null-sink:playback_FL");
+
+    EXPECT_TRUE(happens([this] { return plays(0); }));
+    EXPECT_EQ(seen.streams.size(), 1u);
+}
+
+TEST_F(ObserverTest, AFilterThatPlaysAndRecordsIsTwoStreams)
+{
+    observer->start();
+    const auto source = server.runChain("Audio/Source");
+    server.link("null-sink:monitor_FL", "chain-input:input_FL");
+    const auto filter = server.runFilter(1, 1);
+    server.link("tone-filter:output_1", "null-sink:playback_FL");
+    server.link("chain-output:capture_FL", "tone-filter:input_1");
+    ASSERT_TRUE(happens([this] { return plays(0) && plays(1); }));
+
+    EXPECT_EQ(first().description.direction, Direction::Output);
+    EXPECT_EQ(first().devices, "null-sink");
+    EXPECT_EQ(seen.streams[1].description.direction, Direction::Input);
+    EXPECT_EQ(seen.streams[1].devices, "null-sink");
+    EXPECT_EQ(seen.streams[1].description.name, first().description.name + ".input");
+    server.unlink("chain-output:capture_FL", "tone-filter:input_1");
+    EXPECT_TRUE(happens([this] { return !seen.streams[1].runs; }));
+    EXPECT_TRUE(first().runs);
+}
+
+TEST_F(ObserverTest, WhatPlaysThroughAChainPlaysOnceAndOnTheRealDevice)
+{
+    observer->start();
+    const auto chain = server.runChain("Audio/Sink");
+    server.link("chain-output:output_FL", "null-sink:playback_FL");
+    const auto player = server.playOverPulse("music", "chain-input");
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+
+    EXPECT_EQ(first().description.application, "pacat");
+    EXPECT_EQ(first().devices, "null-sink");
+    server.runToEnd({"pactl", "load-module", "module-null-sink", "sink_name=headset"});
+    server.link("chain-output:output_FL", "headset:playback_FL");
+    EXPECT_TRUE(happens([this] { return first().devices == "headset,null-sink"; }));
+    EXPECT_EQ(seen.streams.size(), 1u);
+}
+
+TEST_F(ObserverTest, WhoComesLateSeesThroughAChainToo)
+{
+    const auto chain = server.runChain("Audio/Sink");
+    server.link("chain-output:output_FL", "null-sink:playback_FL");
+    const auto player = server.playOverPulse("music", "chain-input");
+    server.runToEnd({"sh", "-c", "until pactl list sink-inputs | grep -q pacat; do sleep 0.01; done"});
+    observer->start();
+    ASSERT_TRUE(happens([this] { return plays(0); }));
+
+    EXPECT_EQ(first().devices, "null-sink");
+    EXPECT_EQ(seen.streams.size(), 1u);
+}
+
 TEST_F(ObserverTest, AStreamThatDoesNotKeepPaceIsLate)
 {
     observer->start();

@@ -282,6 +282,28 @@ TEST(ReadFormatTest, OtherFormatsThanSoundAreIgnored)
         std::nullopt);
 }
 
+TEST(ReadRateTest, IsThatOfASoundsFormat)
+{
+    const auto rateOf = [](std::uint32_t mediaType) {
+        return readRate(PodBuilder()
+                            .object(SPA_TYPE_OBJECT_Format)
+                            .key(SPA_FORMAT_mediaType)
+                            .id(mediaType)
+                            .key(SPA_FORMAT_AUDIO_rate)
+                            .choice()
+                            .integer(44100)
+                            .end()
+                            .build());
+    };
+    EXPECT_EQ(rateOf(SPA_MEDIA_TYPE_audio), 44100);
+    EXPECT_EQ(rateOf(SPA_MEDIA_TYPE_video), std::nullopt);
+    EXPECT_EQ(readRate(PodBuilder().integer(1).build()), std::nullopt);
+    EXPECT_EQ(
+        readRate(
+            PodBuilder().object(SPA_TYPE_OBJECT_Format).key(SPA_FORMAT_mediaType).id(SPA_MEDIA_TYPE_audio).build()),
+        std::nullopt);
+}
+
 // ---- Cycles ----
 
 struct Times {

@@ -19,6 +19,7 @@ public:
              fmt::format("appeared {} role={} application={}",
                          description.direction == Direction::Output ? "output" : "input", description.role,
                          description.application));
+        descriptions.push_back(description);
     }
     void runningChanged(StreamSerial stream, bool running, Moment) override
     {
@@ -41,6 +42,8 @@ public:
 
     // The events since the last call, such as "500 runs".
     std::vector<std::string> news() { return std::exchange(heard_, {}); }
+
+    std::vector<StreamDescription> descriptions; // of all that have appeared
 
 private:
     void hear(StreamSerial stream, const std::string& what) { heard_.push_back(fmt::format("{} {}", stream, what)); }

@@ -502,6 +502,121 @@ TEST_F(ReporterTest, APauseIsReportedThoughTheDeviceIsStillRestless)
     EXPECT_THAT(news(), ElementsAre("RouteChange State 4.09", "Playback Start 4.15"));
 }
 
+// ---- Filters ----
+
+class ReporterFilterTest : public ReporterTest {
+protected:
+    ReporterFilterTest()
+    {
+        reporter.appeared(stream, {.name = "ardour#500", .isFilter = true}, at(0));
+        reporter.volumeChanged(stream, 1, at(0));
+        news();
+    }
+    // A link with the speaker is added or removed; so many there are now.
+    void link(int links, double time)
+    {
+        reporter.devicesChanged(stream, links > 0 ? "speaker" : "", at(time));
+        if (links > 0)
+            reporter.formatChanged(stream, {"F32P/48000/" + std::to_string(links), links}, at(time));
+        reporter.runningChanged(stream, links > 0, at(time));
+    }
+    void linkTwice(double time)
+    {
+        link(1, time);
+        link(2, time + 0.01);
+    }
+    void unlinkTwice(double time)
+    {
+        link(1, time);
+        link(0, time + 0.01);
+    }
+};
+
+TEST_F(ReporterFilterTest, TheFirstStartWaitsForTheOtherLinks)
+{
+    linkTwice(1);
+    EXPECT_THAT(news(), IsEmpty());
+    pass(3);
+
+    EXPECT_THAT(news(), ElementsAre("Playback Start 1"));
+    EXPECT_EQ(last().get<std::string>("session_selected_format"), "F32P/48000/2");
+    EXPECT_EQ(last().get<std::string>("active_devices"), "speaker");
+}
+
+TEST_F(ReporterFilterTest, LinksThatGoOneByOneAreAStopWithAllChannels)
+{
+    linkTwice(1);
+    pass(3);
+    news();
+    unlinkTwice(4);
+    pass(6);
+
+    EXPECT_THAT(news(), ElementsAre("Playback Stop 4.01", "RouteChange State 4.01"));
+    EXPECT_EQ(service.callsOf("Playback Stop").at(0).get<std::string>("session_selected_format"), "F32P/48000/2");
+    EXPECT_EQ(service.callsOf("Playback Stop").at(0).get<std::string>("active_devices"), "speaker");
+    EXPECT_EQ(last().get<std::string>("active_devices"), "none");
+}
+
+TEST_F(ReporterFilterTest, ALaterStartNamesTheDevice)
+{
+    linkTwice(1);
+    pass(3);
+    unlinkTwice(4);
+    pass(6);
+    news();
+    linkTwice(7);
+    pass(9);
+
+    EXPECT_THAT(news(), ElementsAre("RouteChange State 7", "Playback Start 7"));
+    EXPECT_EQ(last().get<std::string>("active_devices"), "speaker");
+    EXPECT_EQ(last().get<std::string>("session_selected_format"), "F32P/48000/2");
+}
+
+TEST_F(ReporterFilterTest, ALinkMoreIsAChangeOfFormat)
+{
+    linkTwice(1);
+    pass(3);
+    news();
+    link(3, 4);
+    pass(6);
+
+    EXPECT_THAT(news(), ElementsAre("Setup State 4"));
+    EXPECT_EQ(last().get<std::int64_t>("mChannelsPerFrame"), 3);
+}
+
+TEST_F(ReporterFilterTest, TheShortestRunHasItsDeviceAndFormat)
+{
+    link(1, 1);
+    link(0, 1.02);
+    reporter.gone(stream, at(1.03));
+
+    EXPECT_THAT(news(),
+                ElementsAre("Playback Start 1", "Playback Stop 1.02", "Playback Deactivate 1.03", "stop", "destroy"));
+    EXPECT_EQ(service.callsOf("Playback Start").at(0).get<std::string>("active_devices"), "speaker");
+    EXPECT_EQ(service.callsOf("Playback Start").at(0).get<std::string>("session_selected_format"), "F32P/48000/1");
+}
+
+TEST_F(ReporterFilterTest, EveryMessageNamesTheStream)
+{
+    linkTwice(1);
+    pass(3);
+    reporter.cycleWasLate(stream, at(3));
+    reporter.volumeChanged(stream, 0.5, at(3.5));
+    link(3, 4);
+    pass(4.5);
+    reporter.devicesChanged(stream, "headset", at(5));
+    pass(9);
+    reporter.gone(stream, at(10));
+
+    std::vector<std::string> named;
+    for (const auto& call : service.calls)
+        if (call.get<std::string>("stream") == "ardour#500")
+            named.push_back(call.what);
+    EXPECT_THAT(named,
+                ElementsAre("Playback Start", "Volume State", "Setup State", "Error IssueDetector", "RouteChange State",
+                            "Playback Stop", "Playback Deactivate"));
+}
+
 // ---- Late cycles ----
 
 TEST_F(ReporterTest, LateCyclesAreOneEpisodeUntilThereIsQuiet)
