@@ -9,6 +9,7 @@
 #include <cstddef>
 #include <fmt/format.h>
 #include <kesto/kesto.hpp>
+#include <kesto/playback.hpp>
 #include <linux/filter.h>
 #include <linux/seccomp.h>
 #include <stdexcept>
@@ -41,6 +42,8 @@ public:
         check(client_.open(options));
         check(client_.createSession(sampleReporterID));
         check(client_.startSession(sampleReporterID));
+        playback_ = kesto::Playback(client_, "player", kesto::ServiceType::Test);
+        check(playback_.start({"S16LE", 44100, 2}, "speaker"));
         settle();
     }
 
@@ -49,7 +52,7 @@ public:
     {
         message_.clear()
             .add("session_output_running", true)
-            .add("session_selected_format", "lpcm, 48 kHz, 24 bit")
+            .add("session_selected_format", "S24LE/48000/2")
             .add("mChannelsPerFrame", 2)
             .add("active_devices", "Built-in Speakers")
             .add("PomoSessionVolume", 0.8125)
@@ -60,12 +63,14 @@ public:
             .add("frames_rendered", number_++);
     }
     void send() { check(client_.send(message_, kesto::Category::Playback, kesto::EventType::Start, sampleReporterID)); }
+    // A change each time.
+    void setVolume() { check(playback_.volume(number_++ % 2 == 0 ? 0.25 : 0.75)); }
     // Waits until all messages are answered.
     void settle()
     {
         const auto isSettled = [this] {
             const auto counts = client_.statistics();
-            return client_.state() == kesto::State::Connected && counts.answered == counts.queued;
+            return client_.flush(std::chrono::seconds(1)) == kesto::Status::Ok && counts.answered == counts.queued;
         };
         constexpr std::chrono::seconds patience(10);
         for (const auto start = Clock::now(); !isSettled(); std::this_thread::sleep_for(std::chrono::milliseconds(1)))
@@ -75,6 +80,7 @@ public:
 
 private:
     kesto::Client client_;
+    kesto::Playback playback_;
     kesto::Message message_;
     std::uint32_t number_ = numberMark;
 };
@@ -173,6 +179,7 @@ void measureClientLibrary(const BenchOptions& options, Report& report)
 
     SendTimes ours;
     SendTimes built;
+    SendTimes volumes;
     SendTimes theirs;
     std::vector<double> calls;
     std::vector<double> theirCalls;
@@ -186,6 +193,7 @@ void measureClientLibrary(const BenchOptions& options, Report& report)
                 reporter.send();
             },
             [&] { reporter.settle(); });
+        time(volumes, [] {}, [&] { reporter.setVolume(); }, [&] { reporter.settle(); });
         time(theirs, [] { }, sendToSocket, [] { });
         calls.push_back(systemCallsOf([&] {
             reporter.build();
@@ -201,6 +209,8 @@ void measureClientLibrary(const BenchOptions& options, Report& report)
     report.add({fmt::format("{}, system calls of {}", what, burst), "", calls, PeerFigure{socket, theirCalls},
                 Target::figureAtMost(0)});
     report.add({"building the message and sending it, median", "ns", built.medians});
+    report.add({"setting a playback's volume, caller's side, median", "ns", volumes.medians, std::nullopt,
+                Target::figureAtMost(1000)});
 }
 
 } // namespace bench

@@ -53,6 +53,7 @@ struct ClientSettings {
     std::size_t unansweredLimit;
     bool wakeOnSend;
     bool reconnect;
+    bool stampsMessages;
     std::chrono::milliseconds firstRetry;
     std::chrono::milliseconds longestRetry;
     StateListener stateChanged;

@@ -1,8 +1,7 @@
 // libkesto as its users get it: installed, found with pkg-config or CMake, and linked by programs outside of the source
 // tree. The examples must compile without a warning, and report as they describe.
 #include "kesto/kesto.h"
-#include "sdk/FakeService.h"
-#include "sdk/Process.h"
+#include "sdk/PlayTimes.h"
 #include "support/TemporaryDirectory.h"
 
 #include <filesystem>
@@ -13,12 +12,10 @@
 
 namespace {
 
-using foundation::Array;
-using foundation::Dictionary;
-using sdk_test::FakeService;
 using sdk_test::Finished;
 using sdk_test::Process;
 using sdk_test::run;
+using testing::ElementsAre;
 using testing::HasSubstr;
 using testing::StartsWith;
 
@@ -69,24 +66,41 @@ protected:
         EXPECT_EQ(compiled.errors, "");
     }
 
-    // Runs a player against a service, which must get all reports.
-    static void expectReports(const std::string& program)
+    // Runs a program with a service that computes play times. It ends well and says nothing but this.
+    static void runWith(const end_to_end::Kestod& service, const std::string& program, const std::string& output)
     {
-        const support::TemporaryDirectory runtime;
-        FakeService service(runtime / "service");
-        const Finished played =
-            run({program}, {}, {"KESTO_SOCKET=" + (runtime / "service").string(), "LD_LIBRARY_PATH=" + library()});
+        Process::Environment environment = sdk_test::surroundings(service);
+        environment.push_back("LD_LIBRARY_PATH=" + library());
+        const Finished played = run({program}, {}, environment);
         EXPECT_EQ(played.status, 0) << played.errors;
         EXPECT_EQ(played.errors, "");
-        EXPECT_EQ(played.output, "the session's run has ended\n2 messages answered, 0 lost\n");
-        const std::vector<Array> calls = service.waitForCalls(8);
-        ASSERT_EQ(calls.size(), 8U);
-        constexpr std::array<std::int64_t, 8> methods{1, 2, 4, 5, 6, 6, 7, 8};
-        for (std::size_t index = 0; index < methods.size(); ++index)
-            EXPECT_EQ(sdk_test::method(calls[index]), methods[index]);
-        EXPECT_EQ(*calls[2][2].dictionary(), (Dictionary{{"HostApplicationDisplayID", "org.example.player"}}));
-        EXPECT_EQ(*calls[4][2].dictionary()->find("session_output_running"), foundation::Value(true));
-        EXPECT_EQ(*calls[5][2].dictionary()->find("session_output_running"), foundation::Value(false));
+        EXPECT_EQ(played.output, output);
+    }
+
+    // What the service stores of each player.
+    static void expectPlayInC(const std::string& program)
+    {
+        end_to_end::Kestod service(sdk_test::internalBuild());
+        service.startAndAwait();
+        runWith(service, program, "");
+        EXPECT_THAT(sdk_test::playTimes(service, 4),
+                    ElementsAre("2.0 s at 1 on speaker as S16LE/44100/2, 2 channels, by org.example.player",
+                                "4.0 s at 0.5 on speaker as S16LE/44100/2, 2 channels, by org.example.player",
+                                "1.0 s at 0.5 on speaker as S16LE/44100/2, 2 channels, by org.example.player",
+                                "5.0 s at 0.5 on headset as S16LE/44100/2, 2 channels, by org.example.player"));
+        EXPECT_THAT(sdk_test::messagesWith(service, "session_duration", 1), ElementsAre("Playback.Deactivate 13.0"));
+    }
+    static void expectPlayInCPlusPlus(const std::string& program)
+    {
+        end_to_end::Kestod service(sdk_test::internalBuild());
+        service.startAndAwait();
+        runWith(service, program, "");
+        EXPECT_THAT(sdk_test::playTimes(service, 4),
+                    ElementsAre("3.0 s at 0.8 on hdmi as F32LE/48000/6, 6 channels, by org.example.player",
+                                "2.0 s at 0 on hdmi as F32LE/48000/6, 6 channels, by org.example.player",
+                                "1.0 s at 0.8 on hdmi as F32LE/48000/6, 6 channels, by org.example.player",
+                                "6.0 s at 0.8 on hdmi,speaker as F32LE/48000/2, 2 channels, by org.example.player"));
+        EXPECT_THAT(sdk_test::messagesWith(service, "late_cycles", 1), ElementsAre("Error.IssueDetector 12.0"));
     }
 
     // Runs a driver helper. Its channels must exist as long as it runs.
@@ -133,22 +147,36 @@ TEST_F(ExamplesTest, PkgConfigFindsTheLibraryWhereItWasMovedTo)
     }
 }
 
-TEST_F(ExamplesTest, ThePlayerInCReports)
+TEST_F(ExamplesTest, ThePlayerInCReportsWhatItPlays)
 {
     const std::string program = *directory_ / "player_c";
     compile({KESTO_C_COMPILER, "-std=c11", "-Wall", "-Wextra", "-Wpedantic", "-Werror", examples + "/player.c", "-o",
              program},
             {"--cflags", "--libs"});
-    expectReports(program);
+    expectPlayInC(program);
 }
 
-TEST_F(ExamplesTest, ThePlayerInOlderCPlusPlusReports)
+TEST_F(ExamplesTest, ThePlayerInOlderCPlusPlusReportsWhatItPlays)
 {
     const std::string program = *directory_ / "player_cpp";
     compile({KESTO_CXX_COMPILER, "-std=c++17", "-fno-rtti", "-Wall", "-Wextra", "-Wpedantic", "-Wshadow",
              "-Wold-style-cast", "-Wconversion", "-Werror", examples + "/player.cpp", "-o", program},
             {"--cflags", "--libs"});
-    expectReports(program);
+    expectPlayInCPlusPlus(program);
+}
+
+TEST_F(ExamplesTest, TheSessionOfPlainCallsReportsWhatItPlays)
+{
+    const std::string program = *directory_ / "session";
+    compile({KESTO_C_COMPILER, "-std=c11", "-Wall", "-Wextra", "-Wpedantic", "-Werror", examples + "/session.c", "-o",
+             program},
+            {"--cflags", "--libs"});
+    end_to_end::Kestod service(sdk_test::internalBuild());
+    service.startAndAwait();
+    runWith(service, program, "the session's run has ended\n4 messages answered, 0 lost\n");
+    EXPECT_THAT(sdk_test::playTimes(service, 2),
+                ElementsAre("2.0 s at 0.8 on speaker,headset as S16LE/44100/2, 2 channels, by org.example.session",
+                            "4.0 s at 0.8 on speaker,headset as S16LE/44100/2, 2 channels, by org.example.session"));
 }
 
 TEST_F(ExamplesTest, TheDriverHelpersInCAndCPlusPlusPublish)
@@ -204,20 +232,22 @@ TEST_F(ExamplesTest, WhatDocumentsAndHeadersShowCompilesAsItStands)
     const std::string headers = prefix() + "/include/kesto/";
     std::size_t inC = 0;
     const std::string fileInC = *directory_ / "shown.c";
-    std::ofstream(fileInC) << "#include <kesto/channels.h>\n#include <kesto/trace.h>\n"
-                           << functionsOf({headers + "kesto.h", headers + "channels.h", headers + "trace.h"}, "c", inC);
-    EXPECT_EQ(inC, 4U);
+    std::ofstream(fileInC) << "#include <kesto/channels.h>\n#include <kesto/playback.h>\n#include <kesto/trace.h>\n"
+                           << functionsOf({source + "docs/libkesto.md", headers + "kesto.h", headers + "channels.h",
+                                           headers + "playback.h", headers + "trace.h"},
+                                          "c", inC);
+    EXPECT_EQ(inC, 6U);
     compile({KESTO_C_COMPILER, "-std=c11", "-fsyntax-only", "-Wall", "-Wextra", "-Wno-unused", "-Werror", fileInC},
             {"--cflags"});
 
     std::size_t inCpp = 0;
     const std::string fileInCpp = *directory_ / "shown.cpp";
-    std::ofstream(fileInCpp)
-        << "#include <kesto/channels.hpp>\n#include <kesto/trace.hpp>\nextern kesto::Client client;\n"
-        << functionsOf({source + "README.md", source + "docs/libkesto.md", headers + "kesto.hpp",
-                        headers + "channels.hpp", headers + "trace.hpp"},
-                       "c++", inCpp);
-    EXPECT_EQ(inCpp, 7U);
+    std::ofstream(fileInCpp) << "#include <kesto/channels.hpp>\n#include <kesto/playback.hpp>\n#include "
+                                "<kesto/trace.hpp>\nextern kesto::Client client;\n"
+                             << functionsOf({source + "README.md", source + "docs/libkesto.md", headers + "kesto.hpp",
+                                             headers + "channels.hpp", headers + "playback.hpp", headers + "trace.hpp"},
+                                            "c++", inCpp);
+    EXPECT_EQ(inCpp, 9U);
     compile({KESTO_CXX_COMPILER, "-std=c++17", "-fsyntax-only", "-Wall", "-Wextra", "-Werror", fileInCpp},
             {"--cflags"});
 }
@@ -245,8 +275,19 @@ TEST_F(ExamplesTest, AProjectFindsTheLibraryWithCMake)
     ASSERT_EQ(configured.status, 0) << configured.output << configured.errors;
     const Finished built = run({KESTO_CMAKE, "--build", project + "/build"});
     ASSERT_EQ(built.status, 0) << built.output << built.errors;
-    expectReports(project + "/build/player");
-    expectReports(project + "/build/static-player");
+    expectPlayInCPlusPlus(project + "/build/player");
+    expectPlayInC(project + "/build/static-player");
+}
+
+TEST_F(ExamplesTest, ThePackageForPythonFindsTheInstalledLibrary)
+{
+    if (!sanitizers.empty())
+        GTEST_SKIP() << "Python itself is not built with a sanitizer";
+    const Finished printed =
+        run({KESTO_PYTHON, "-B", "-c", "import kesto; print(kesto.version())"}, {},
+            {"PYTHONPATH=" + prefix() + "/" + KESTO_PYTHON_DIRECTORY, "LD_LIBRARY_PATH=" + library(), "KESTO_LIBRARY"});
+    EXPECT_EQ(printed.errors, "");
+    EXPECT_EQ(printed.output, std::string(kesto_version()) + "\n");
 }
 
 TEST_F(ExamplesTest, OnlyTheInterfaceIsVisibleFromOutside)

@@ -14,6 +14,8 @@
 //     kesto_client_close(client, 1000);
 //     kesto_client_free(client);
 //
+// What a program plays or records is reported with less: see playback.h.
+//
 // Threads: every function that takes a client may be called from any thread at any time until
 // `kesto_client_free`; a message is used by one thread at a time. All callbacks of a client run on its own
 // thread, one after the other and without any lock, so that they may call the client again; while one runs, the
@@ -291,8 +293,8 @@ typedef struct kesto_options {
     // A file name. Null: "com.quarn.kesto.reporting".
     const char* service_name;
     // The size of the queue between callers and the client's thread, in bytes, rounded up to a power of two from 4 KiB
-    // to 64 MiB. 0: 256 KiB, enough for some 800 messages of ten entries. The last eighth is kept for calls other than
-    // send, and a message may take a quarter.
+    // to 64 MiB. 0: 256 KiB, enough for some 800 messages of ten entries, the times among them. The last eighth is kept
+    // for calls other than send, and a message may take a quarter.
     size_t queue_bytes;
     // How many calls the thread sends before it waits for answers; so a slow service lets the queue fill, not the
     // memory. 0: 4096.
@@ -314,6 +316,8 @@ typedef struct kesto_options {
     kesto_release_callback state_release;
     // Whether the client asks the service for the descriptors to emit trace events: see trace.h.
     bool trace;
+    // False: `kesto_client_send` adds the time to each message that does not have it.
+    bool without_stamps;
 } kesto_options;
 
 // Makes a client and starts its thread, which begins to connect. Calls are possible immediately and wait for the
@@ -322,17 +326,17 @@ typedef struct kesto_options {
 // address), KESTO_OUT_OF_MEMORY or KESTO_SYSTEM_ERROR (with `errno`).
 KESTO_API kesto_status kesto_client_open(const kesto_options* options, kesto_client** client);
 
-// Refuses further calls, waits up to `timeout_ms` until the taken calls are sent and answered (except starts of
-// sessions), and ends the connection; the service then stops the client's sessions. Unanswered calls get KESTO_CLOSED.
-// When it returns, all callbacks have been called and released; only a call that another thread makes at the same
-// moment may be left to `kesto_client_free`. A second close does nothing. KESTO_TIMED_OUT, KESTO_CONNECTION_LOST or
-// KESTO_NOT_CONNECTED if calls may be unanswered; with 0 it does not wait. The client is closed in any case, except in
-// a callback: KESTO_WRONG_THREAD.
+// Refuses further calls, stops the playbacks and recordings that are started (playback.h), waits up to `timeout_ms`
+// until the taken calls are sent and answered (except starts of sessions), and ends the connection; the service then
+// stops the client's sessions. Unanswered calls get KESTO_CLOSED. When it returns, all callbacks have been called and
+// released; only a call that another thread makes at the same moment may be left to `kesto_client_free`. A second close
+// does nothing. KESTO_TIMED_OUT, KESTO_CONNECTION_LOST or KESTO_NOT_CONNECTED if calls may be unanswered; with 0 it
+// does not wait. The client is closed in any case, except in a callback: KESTO_WRONG_THREAD.
 KESTO_API kesto_status kesto_client_close(kesto_client* client, uint32_t timeout_ms);
 
-// Closes the client without waiting for answers, if it is not closed yet, and frees it. No other thread may use it any
-// more. It may be called in a callback of the client: the rest is then done after the callback has returned. Null is
-// allowed.
+// Closes the client without waiting, if it is not closed yet, and frees it. What was taken is still sent as far as the
+// socket takes it at once. No other thread may use it any more. It may be called in a callback of the client: the rest
+// is then done after the callback has returned. Null is allowed.
 KESTO_API void kesto_client_free(kesto_client* client);
 
 // Waits until all earlier calls of this thread are sent and answered (except starts of sessions, which are answered
@@ -382,6 +386,15 @@ KESTO_API kesto_status kesto_client_start_session(kesto_client* client, kesto_re
 // Sends a message to the sessions of these reporters, of any client; a null list means all started sessions, an empty
 // one none. The caller may reuse the message as soon as this returns. Answered without a result.
 //
+// The time of the call goes with the message, since the service computes play times from it:
+// "kestoreporting_timestamp", a double, the seconds since 1970, and "systemuptime_sec", an integer, the seconds since
+// the device started, time asleep included. A key that the message has itself, not counting nested dictionaries, is
+// left as it is. `kesto_message_size` does not count them; on the wire they take at most 70 bytes. `without_stamps`
+// changes that.
+//
+// The service does not record a message that repeats the last one of its category and type, and the time does not make
+// it another: so give a second Start something new, such as the number of the run.
+//
 // For real-time threads: no lock, no allocation, no wait. It also makes no system call while a session of this client
 // is started. The session counts as started from the return of start until stop, destroy or another create is called or
 // the connection is lost. When no session is started and the client's thread sleeps, the first send wakes it with one
@@ -417,18 +430,18 @@ KESTO_API kesto_status kesto_client_kill_service(kesto_client* client, kesto_ans
 
 // ---- Counts ----
 
-// Counts of the messages passed to `kesto_client_send` since the client was opened. At any time queued = answered +
-// lost + messages on their way.
+// Counts of the messages passed to `kesto_client_send`, or made for playbacks and recordings (playback.h), since the
+// client was opened. At any time queued = answered + lost + messages on their way.
 typedef struct kesto_statistics {
     uint64_t queued; // taken
     uint64_t sent; // passed completely to the connection
     uint64_t answered; // answered by the service
     uint64_t refused; // included in these: answered with an error
     uint64_t lost; // taken, but the connection ended or the client was closed before the answer
-    // Not taken:
+    // Not taken, of messages and of calls of playbacks and recordings:
     uint64_t dropped_queue_full;
     uint64_t dropped_not_connected; // or closed
-    uint64_t dropped_unusable; // too large, or with a failure of its own
+    uint64_t dropped_unusable; // too large, with a failure of its own, or with an invalid argument
     // Of the whole client:
     uint64_t connections; // that were made
     uint64_t unexpected_answers; // to calls that expect none

@@ -11,6 +11,8 @@
 //     message.add("session_output_running", true).add("PomoSessionVolume", 0.8);
 //     client.send(message, kesto::Category::Playback, kesto::EventType::Start, 42);
 //
+// What a program plays or records is reported with less: see playback.hpp.
+//
 // This is a thin layer over kesto.h, all of it inline: the library's interface is C, so that one
 // binary serves every compiler and every standard library. The rules in kesto.h about threads, real time, forks and
 // lost connections hold here, too. C++17 or later; no exceptions and no run-time types are needed. A callback that
@@ -386,6 +388,7 @@ struct Options {
     std::chrono::milliseconds longestRetry{0}; // 0: 10 s
     StateCallback stateChanged;
     bool trace = false; // true: events can be emitted into the kernel's trace; see trace.hpp
+    bool stamp = true; // whether `send` adds the time to messages that do not have it
 };
 
 // One connection to the service. Any thread; but no other thread may use it while it is opened, moved or destroyed. A
@@ -418,6 +421,7 @@ public:
         given.first_retry_ms = milliseconds(options.firstRetry);
         given.longest_retry_ms = milliseconds(options.longestRetry);
         given.trace = options.trace;
+        given.without_stamps = !options.stamp;
         if (options.stateChanged) {
             given.state_changed = callState;
             given.state_user = new StateCallback(options.stateChanged);

@@ -81,6 +81,7 @@ libkesto::ClientSettings settings(const kesto_options& options, std::vector<std:
             .unansweredLimit = orDefault(options.unanswered_limit, defaultUnansweredLimit),
             .wakeOnSend = options.wake_on_send,
             .reconnect = options.reconnect,
+            .stampsMessages = !options.without_stamps,
             .firstRetry = firstRetry,
             .longestRetry =
                 std::max(firstRetry, milliseconds(orDefault(options.longest_retry_ms, defaultLongestRetry))),
@@ -276,7 +277,7 @@ kesto_status kesto_client_close(kesto_client* client, uint32_t timeout_ms)
 void kesto_client_free(kesto_client* client)
 {
     if (client != nullptr)
-        kesto_client::free(std::unique_ptr<kesto_client>(client));
+        kesto_client::free(client);
 }
 
 kesto_status kesto_client_flush(kesto_client* client, uint32_t timeout_ms)

@@ -29,9 +29,11 @@ std::unique_ptr<kesto_client> kesto_client::create(Settings settings)
 }
 
 kesto_client::kesto_client(Settings settings, platform::FileDescriptor doorbell)
-    : process_(::getpid()),
+    : stampsMessages_(settings.stampsMessages),
+      reconnects_(settings.reconnect),
+      process_(::getpid()),
       mailbox_(settings.queueBytes, std::move(doorbell)),
-      courier_(std::move(settings), mailbox_, flushes_, counters_)
+      courier_(std::move(settings), mailbox_, streams_, flushes_, counters_)
 {
 }
 
@@ -47,26 +49,33 @@ void kesto_client::run() noexcept
     pthread_setname_np(pthread_self(), "libkesto");
     courier_.run();
     if (freesItself_)
+        drop();
+}
+
+// Deletes the client when the last holder has gone.
+void kesto_client::drop() noexcept
+{
+    if (holders_.fetch_sub(1) == 1)
         delete this;
 }
 
-void kesto_client::free(std::unique_ptr<kesto_client> client) noexcept
+void kesto_client::free(kesto_client* client) noexcept
 {
-    if (client->process_ != ::getpid()) {
-        // The parent's thread does not exist here, and its work may be half done: nothing can be destroyed safely.
-        static_cast<void>(client.release());
+    // In a forked child the parent's thread does not exist, and its work may be half done: nothing can be destroyed
+    // safely.
+    if (client->process_ != ::getpid())
         return;
-    }
     client->isClosing_.store(true);
     if (!client->isOwnThread()) {
         static_cast<void>(client->close(std::chrono::milliseconds(0)));
-        return;
+        client->courier_.answerLateCalls();
+        return client->drop();
     }
+    client->stopStreams();
     client->freesItself_ = true;
     client->courier_.stop();
     const foundation::Lock lock(client->joining_);
     client->thread_.detach();
-    static_cast<void>(client.release());
 }
 
 kesto_status kesto_client::refusal() const noexcept
@@ -88,7 +97,7 @@ kesto_status kesto_client::call(CallHead head) noexcept
     if (const kesto_status status = refusal(); status != KESTO_OK)
         return status;
     if (courier_.isReportingState() && isOwnThread()) {
-        if (const kesto_status status = courier_.putFirst(head, {}, {}); status != KESTO_OK)
+        if (const kesto_status status = courier_.putFirst(head); status != KESTO_OK)
             return status;
     } else if (!mailbox_.putCall(head)) {
         return KESTO_QUEUE_FULL;
@@ -122,7 +131,7 @@ bool kesto_client::fits(std::size_t entryBytes, std::size_t reporterCount) const
 {
     const std::size_t most = std::min(mailbox_.largestRecord(), platform::longestFrame);
     return reporterCount <= client::mostReportersOfAMessage
-        && entryBytes + libkesto::frameOverhead(reporterCount) + sizeof(CallHead) <= most;
+        && entryBytes + libkesto::frameOverhead(reporterCount) + libkesto::Stamps::longest + sizeof(CallHead) <= most;
 }
 
 kesto_status kesto_client::send(const libkesto::MessageEncoder& message, CallHead head,
@@ -140,11 +149,13 @@ kesto_status kesto_client::send(const libkesto::MessageEncoder& message, CallHea
         ++counters_.droppedNotConnected;
         return status;
     }
-    head.entryCount = message.entryCount();
+    const libkesto::Stamps stamps =
+        stampsMessages_ ? message.missingStamps(libkesto::currentMoment()) : libkesto::Stamps();
+    head.entryCount = message.entryCount() + stamps.entryCount();
     head.reporterCount = static_cast<std::uint32_t>(reporters.size());
     if (courier_.isReportingState() && isOwnThread())
-        status = courier_.putFirst(head, bytesOf(reporters), message.entries());
-    else if (!mailbox_.putMessage(head, bytesOf(reporters), message.entries()))
+        status = courier_.putFirst(head, bytesOf(reporters), message.entries(), stamps.entries());
+    else if (!mailbox_.putMessage(head, bytesOf(reporters), message.entries(), stamps.entries()))
         status = KESTO_QUEUE_FULL;
     if (status != KESTO_OK) {
         ++counters_.droppedQueueFull;
@@ -153,6 +164,65 @@ kesto_status kesto_client::send(const libkesto::MessageEncoder& message, CallHea
     ++counters_.queued;
     callback.handOver();
     return KESTO_OK;
+}
+
+kesto_status kesto_client::refusalOfStreams() const noexcept
+{
+    const kesto_status status = refusal();
+    return status == KESTO_NOT_CONNECTED && reconnects_ ? KESTO_OK : status; // a later connection gets the state
+}
+
+libkesto::Stream& kesto_client::createStream(libkesto::Direction direction, std::string_view application,
+                                             kesto_service_type type)
+{
+    libkesto::Stream& stream = streams_.create(direction, application, type);
+    ++holders_;
+    return stream;
+}
+
+void kesto_client::freeStream(const libkesto::Stream& stream) noexcept
+{
+    if (process_ != ::getpid())
+        return;
+    const libkesto::Moment now = libkesto::currentMoment();
+    if (refusalOfStreams() == KESTO_OK) // in its place among the calls, so that a flush waits for it
+        static_cast<void>(putStamped({.stream = const_cast<libkesto::Stream*>(&stream)}, {}, {}));
+    streams_.free(stream, mailbox_.writePosition(), now);
+    mailbox_.ring();
+    drop();
+}
+
+// All of them. Without room for the record they end with the connection.
+void kesto_client::stopStreams() noexcept
+{
+    if (state() != KESTO_STATE_CLOSED)
+        static_cast<void>(putStamped({.stream = nullptr}, {}, {}));
+}
+
+kesto_status kesto_client::putStreamRecord(libkesto::StreamRecord record, std::string_view device,
+                                           std::string_view encoding) noexcept
+{
+    if (const kesto_status status = refusalOfStreams(); status != KESTO_OK) {
+        ++counters_.droppedNotConnected;
+        return status;
+    }
+    if (!putStamped(record, device, encoding)) {
+        ++counters_.droppedQueueFull;
+        return KESTO_QUEUE_FULL;
+    }
+    return KESTO_OK;
+}
+
+// False if the queue has no room.
+bool kesto_client::putStamped(libkesto::StreamRecord record, std::string_view device,
+                              std::string_view encoding) noexcept
+{
+    using enum libkesto::StreamAction;
+    record.when = libkesto::currentMoment();
+    const bool decidesPlayTime =
+        record.action == Start || record.action == Stop || record.action == Pause || record.action == Resume;
+    const kesto_operation operation = record.action == Start ? libkesto::streamStart : libkesto::streamOperation;
+    return mailbox_.putStreamRecord(operation, bytesOf(record), device, encoding, decidesPlayTime);
 }
 
 kesto_status kesto_client::waitForAnswers(std::chrono::milliseconds timeout) noexcept
@@ -176,6 +246,7 @@ kesto_status kesto_client::close(std::chrono::milliseconds timeout) noexcept
         return KESTO_WRONG_THREAD;
     isClosing_.store(true);
     kesto_status status = KESTO_OK;
+    stopStreams();
     if (timeout.count() > 0 && state() != KESTO_STATE_CLOSED)
         status = waitForAnswers(timeout);
     courier_.stop();

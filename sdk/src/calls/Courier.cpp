@@ -14,22 +14,24 @@ namespace {
 constexpr Courier::Milliseconds forever{-1}; // as in poll
 constexpr std::uint64_t traceRequest = 0; // the number of this request; numbers of calls begin with 1
 
+// The record of a stream behind the head that all records have.
+std::string_view streamRecordOf(std::string_view record) noexcept
+{
+    return record.substr(sizeof(CallHead));
+}
+
 } // namespace
 
-Courier::Courier(ClientSettings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters)
+Courier::Courier(ClientSettings settings, Mailbox& mailbox, Streams& streams, Flushes& flushes, Counters& counters)
     : settings_(std::move(settings)),
       mailbox_(mailbox),
+      streams_(streams),
       flushes_(flushes),
       counters_(counters),
       connection_(counters),
       calls_(counters),
       retryPause_(settings_.firstRetry)
 {
-}
-
-Courier::~Courier()
-{
-    loseWaitingCalls(KESTO_CLOSED);
 }
 
 void Courier::stop() noexcept
@@ -47,12 +49,26 @@ void Courier::run() noexcept
             disconnect({KESTO_OUT_OF_MEMORY});
         }
     }
+    sendTheRest();
     close();
     state_.store(KESTO_STATE_CLOSED);
     calls_.endAll(KESTO_CLOSED);
     loseWaitingCalls(KESTO_CLOSED);
+    streams_.close();
     changeState(KESTO_STATE_CLOSED);
     flushes_.close();
+}
+
+// What was taken before the end goes out as far as the socket takes it without waiting: often it is the stop of what
+// the program has just stopped to play.
+void Courier::sendTheRest() noexcept
+try {
+    if (state_.load() != KESTO_STATE_CONNECTED)
+        return;
+    takeCalls();
+    static_cast<void>(connection_.send());
+} catch (const std::bad_alloc&) {
+    return; // it is lost, as what does not fit into the socket
 }
 
 void Courier::step()
@@ -72,6 +88,7 @@ void Courier::connect()
     retryPause_ = settings_.firstRetry;
     if (settings_.emitter)
         connection_.appendTraceRequest(traceRequest);
+    streams_.renewSessions(*this);
     changeState(KESTO_STATE_CONNECTED);
 }
 
@@ -103,8 +120,10 @@ void Courier::pauseBeforeRetry()
     loseWaitingCalls(KESTO_CONNECTION_LOST); // calls that were made during the change
     flushes_.endAll(KESTO_NOT_CONNECTED);
     static_cast<void>(wait());
-    if (retryAt_ && Clock::now() >= *retryAt_)
-        changeState(KESTO_STATE_CONNECTING);
+    if (!retryAt_ || Clock::now() < *retryAt_)
+        return;
+    loseWaitingCalls(KESTO_CONNECTION_LOST); // so that new sessions begin with what streams have done until now
+    changeState(KESTO_STATE_CONNECTING);
 }
 
 void Courier::exchange()
@@ -149,16 +168,36 @@ void Courier::takeCalls()
     while (canTakeCalls()) {
         const auto record = nextRecord();
         if (!record)
-            return;
-        readCall(*record, call_);
-        connection_.append(lastCall_ + 1, call_);
-        rememberWhetherStarted(call_.head);
-        calls_.add(lastCall_ + 1, call_.head);
-        ++lastCall_;
-        delete call_.head.entries;
+            break;
+        takeRecord(*record);
         popRecord();
         pause_ = shortestPause;
     }
+    streams_.letGo(mailbox_.readPosition(), this);
+}
+
+void Courier::takeRecord(std::string_view record)
+{
+    if (isOfStream(readHead(record).operation))
+        return streams_.follow(streamRecordOf(record), this);
+    readCall(record, call_);
+    putOnTheWay(call_);
+    delete call_.head.entries;
+}
+
+void Courier::takeCall(const Call& call)
+{
+    putOnTheWay(call);
+    if (call.head.operation == KESTO_OPERATION_SEND)
+        ++counters_.queued;
+}
+
+void Courier::putOnTheWay(const Call& call)
+{
+    connection_.append(lastCall_ + 1, call);
+    rememberWhetherStarted(call.head);
+    calls_.add(lastCall_ + 1, call.head);
+    ++lastCall_;
 }
 
 std::optional<std::string_view> Courier::nextRecord() noexcept
@@ -174,14 +213,15 @@ void Courier::popRecord() noexcept
     firstCalls_.pop_front();
 }
 
-kesto_status Courier::putFirst(const CallHead& head, std::string_view reporters, std::string_view entries) noexcept
+kesto_status Courier::putFirst(const CallHead& head, std::string_view reporters, std::string_view entries,
+                               std::string_view stamps) noexcept
 {
-    const std::size_t size = sizeof head + reporters.size() + entries.size();
+    const std::size_t size = sizeof head + reporters.size() + entries.size() + stamps.size();
     if (firstCallsBytes_ + size > settings_.queueBytes)
         return KESTO_QUEUE_FULL;
     try {
         std::string record(bytesOf(head));
-        record.append(reporters).append(entries);
+        record.append(reporters).append(entries).append(stamps);
         firstCalls_.push_back(std::move(record));
     } catch (const std::bad_alloc&) {
         return KESTO_OUT_OF_MEMORY;
@@ -205,17 +245,26 @@ void Courier::loseWaitingCalls(kesto_status status) noexcept
 {
     while (const auto record = nextRecord()) {
         const CallHead head = readHead(*record);
+        if (isOfStream(head.operation)) {
+            if (state_.load() != KESTO_STATE_CLOSED) // afterwards its stream may have gone
+                streams_.follow(streamRecordOf(*record), nullptr);
+            popRecord();
+            continue;
+        }
         const std::unique_ptr<std::string> entries(head.entries);
         popRecord();
         if (head.operation == KESTO_OPERATION_SEND)
             ++counters_.lost;
         answerWithError(++lastCall_, head.operation, head.reporter, Callback(head.callback), status);
     }
+    streams_.letGo(mailbox_.readPosition(), nullptr);
 }
 
 bool Courier::looksByItself() const noexcept
 {
-    return !settings_.wakeOnSend && (!startedReporters_.empty() || calls_.unanswered() > 0);
+    if (settings_.wakeOnSend)
+        return false;
+    return !startedReporters_.empty() || calls_.unanswered() > 0 || (settings_.reconnect && streams_.isAnyStarted());
 }
 
 // How long to sleep. If messages must ring to wake the thread, it first tells callers so.
@@ -225,10 +274,8 @@ Courier::Milliseconds Courier::longestWait() noexcept
         return forever; // the service must act first, and then the socket wakes the thread
     if (nextRecord())
         return Milliseconds(0);
-    if (looksByItself())
-        return pause_;
-    // A call that is just being put in does not ring any more, but will be there in a moment.
-    Milliseconds wait = mailbox_.fallAsleep() ? forever : shortestPause;
+    // If the mailbox does not let it sleep, a call is just being put in, and will be there in a moment.
+    Milliseconds wait = looksByItself() ? pause_ : mailbox_.fallAsleep() ? forever : shortestPause;
     if (retryAt_ && state_.load() == KESTO_STATE_DISCONNECTED) {
         const auto untilRetry = std::chrono::ceil<Milliseconds>(*retryAt_ - Clock::now());
         wait = std::max(Milliseconds(0), wait == forever ? untilRetry : std::min(wait, untilRetry));

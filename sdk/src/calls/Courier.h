@@ -10,6 +10,7 @@
 #include "calls/CallTable.h"
 #include "calls/Flushes.h"
 #include "calls/Mailbox.h"
+#include "calls/Streams.h"
 #include "wire/ServiceConnection.h"
 
 #include <atomic>
@@ -23,7 +24,7 @@
 
 namespace libkesto {
 
-class Courier {
+class Courier final : private CallTaker {
 public:
     using Clock = std::chrono::steady_clock;
     using Milliseconds = std::chrono::milliseconds;
@@ -34,12 +35,12 @@ public:
     // It takes no further calls while the socket has not accepted so many bytes.
     static constexpr std::size_t mostUnsentBytes = 64 * 1024;
 
-    Courier(ClientSettings settings, Mailbox& mailbox, Flushes& flushes, Counters& counters);
-    // Answers the calls that were put in after `run` returned. The thread that frees the client.
-    ~Courier();
+    Courier(ClientSettings settings, Mailbox& mailbox, Streams& streams, Flushes& flushes, Counters& counters);
 
     // Returns after `stop`, when every call has its answer. The client's thread.
     void run() noexcept;
+    // Answers the calls that were put in after `run` returned. The thread that frees the client, after that.
+    void answerLateCalls() noexcept { loseWaitingCalls(KESTO_CLOSED); }
     // Any thread.
     void stop() noexcept;
     [[nodiscard]] kesto_state state() const noexcept { return state_.load(); }
@@ -50,10 +51,11 @@ public:
     // message that was sent while the client was connecting then finds the sessions that the callback creates.
     [[nodiscard]] bool isReportingState() const noexcept { return isReportingState_.load(std::memory_order_relaxed); }
     // Takes over the callback and the configuration's entries if it returns KESTO_OK. The client's thread.
-    [[nodiscard]] kesto_status putFirst(const CallHead& head, std::string_view reporters,
-                                        std::string_view entries) noexcept;
+    [[nodiscard]] kesto_status putFirst(const CallHead& head, std::string_view reporters = {},
+                                        std::string_view entries = {}, std::string_view stamps = {}) noexcept;
 
 private:
+    void sendTheRest() noexcept;
     void step();
     void connect();
     void exchange();
@@ -65,6 +67,9 @@ private:
 
     [[nodiscard]] bool canTakeCalls() const noexcept;
     void takeCalls();
+    void takeRecord(std::string_view record);
+    void takeCall(const Call& call) override; // of a stream
+    void putOnTheWay(const Call& call);
     [[nodiscard]] std::optional<std::string_view> nextRecord() noexcept;
     void popRecord() noexcept;
     void rememberWhetherStarted(const CallHead& head);
@@ -77,6 +82,7 @@ private:
 
     const ClientSettings settings_;
     Mailbox& mailbox_;
+    Streams& streams_;
     Flushes& flushes_;
     Counters& counters_;
     std::atomic<kesto_state> state_ = KESTO_STATE_CONNECTING;

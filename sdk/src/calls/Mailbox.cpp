@@ -4,6 +4,14 @@
 #include <utility>
 
 namespace libkesto {
+namespace {
+
+bool beginsSession(kesto_operation operation) noexcept
+{
+    return operation == KESTO_OPERATION_START_SESSION || operation == streamStart;
+}
+
+} // namespace
 
 Mailbox::Mailbox(std::size_t bytes, platform::FileDescriptor doorbell)
     : bytes_(bytes),
@@ -12,10 +20,10 @@ Mailbox::Mailbox(std::size_t bytes, platform::FileDescriptor doorbell)
 {
 }
 
-bool Mailbox::putMessage(const CallHead& head, std::string_view reporters, std::string_view entries) noexcept
+bool Mailbox::putMessage(const CallHead& head, std::string_view reporters, std::string_view entries,
+                         std::string_view stamps) noexcept
 {
-    const std::size_t keptForOtherCalls = bytes_ / 8;
-    if (!queue_.push({bytesOf(head), reporters, entries}, keptForOtherCalls))
+    if (!queue_.push({bytesOf(head), reporters, entries, stamps}, roomForCalls()))
         return false;
     if (startsUnderway_.load() == 0)
         bell_.ringIfAsleep();
@@ -24,7 +32,7 @@ bool Mailbox::putMessage(const CallHead& head, std::string_view reporters, std::
 
 bool Mailbox::putCall(const CallHead& head) noexcept
 {
-    const bool isStart = head.operation == KESTO_OPERATION_START_SESSION;
+    const bool isStart = beginsSession(head.operation);
     if (isStart)
         ++startsUnderway_;
     const bool hasRoom = queue_.push({bytesOf(head)});
@@ -34,11 +42,26 @@ bool Mailbox::putCall(const CallHead& head) noexcept
     return hasRoom;
 }
 
+bool Mailbox::putStreamRecord(kesto_operation operation, std::string_view record, std::string_view device,
+                              std::string_view encoding, bool usesKeptRoom) noexcept
+{
+    const CallHead head{.operation = operation};
+    const bool isStart = beginsSession(operation);
+    if (isStart)
+        ++startsUnderway_;
+    const bool hasRoom = queue_.push({bytesOf(head), record, device, encoding}, usesKeptRoom ? 0 : roomForCalls());
+    if (!hasRoom && isStart)
+        --startsUnderway_;
+    if (isStart || startsUnderway_.load() == 0)
+        bell_.ringIfAsleep(); // a start even without room: messages may have relied on its ring
+    return hasRoom;
+}
+
 void Mailbox::popFront() noexcept
 {
     const kesto_operation operation = readHead(*queue_.front()).operation;
     queue_.popFront();
-    if (operation == KESTO_OPERATION_START_SESSION)
+    if (beginsSession(operation))
         --startsUnderway_;
 }
 

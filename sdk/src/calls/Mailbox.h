@@ -6,7 +6,7 @@
 // check whether it sleeps.
 //
 // One case is in between: a start is in the queue, and the thread has not taken it yet and may sleep. Every start
-// rings, so messages need not ring meanwhile; `startsUnderway_` shows this to their senders.
+// rings a thread that sleeps, so messages need not ring meanwhile; `startsUnderway_` shows this to their senders.
 #pragma once
 
 #include "Doorbell.h"
@@ -28,9 +28,14 @@ public:
     Mailbox(std::size_t bytes, platform::FileDescriptor doorbell);
 
     // For messages: no system call unless the thread sleeps. False if the queue has no room. Any thread.
-    [[nodiscard]] bool putMessage(const CallHead& head, std::string_view reporters, std::string_view entries) noexcept;
+    [[nodiscard]] bool putMessage(const CallHead& head, std::string_view reporters, std::string_view entries,
+                                  std::string_view stamps = {}) noexcept;
     // For all other calls; room is kept for them that messages cannot use. Always rings. Any thread.
     [[nodiscard]] bool putCall(const CallHead& head) noexcept;
+    // For records of playbacks and recordings; no system call unless the thread sleeps. Those that matter most may use
+    // the room that is kept for calls. Any thread.
+    [[nodiscard]] bool putStreamRecord(kesto_operation operation, std::string_view record, std::string_view device,
+                                       std::string_view encoding, bool usesKeptRoom) noexcept;
     // Any thread.
     void ring() noexcept { bell_.ring(); }
     // The size limit of a message's record: an empty queue always has more room than that.
@@ -51,6 +56,8 @@ public:
     [[nodiscard]] int doorbell() const noexcept { return bell_.descriptor(); }
 
 private:
+    [[nodiscard]] std::size_t roomForCalls() const noexcept { return bytes_ / 8; }
+
     const std::size_t bytes_;
     CallQueue queue_;
     Doorbell bell_;

@@ -13,6 +13,15 @@
 
 namespace libkesto {
 
+// Records of the queue that are not calls of the wire: those of playbacks and recordings. One of the two begins a
+// session, as a start does.
+constexpr kesto_operation streamOperation{-1};
+constexpr kesto_operation streamStart{-2};
+[[nodiscard]] constexpr bool isOfStream(kesto_operation operation) noexcept
+{
+    return operation == streamOperation || operation == streamStart;
+}
+
 // A call as it stands in the queue, before its reporters and entries. Plain data.
 struct CallHead {
     kesto_operation operation;

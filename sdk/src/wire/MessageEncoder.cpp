@@ -37,6 +37,8 @@ void MessageEncoder::clear() noexcept
     containers_.front() = {};
     depth_ = 0;
     hasKey_ = false;
+    hasTimestamp_ = false;
+    hasUptime_ = false;
     failure_ = KESTO_OK;
 }
 
@@ -73,6 +75,8 @@ kesto_status MessageEncoder::addKey(std::string_view key) noexcept
     if (!foundation::isValidUtf8(key))
         return fail(KESTO_INVALID_UTF8);
     hasKey_ = true;
+    hasTimestamp_ |= depth_ == 0 && key == timestampKey;
+    hasUptime_ |= depth_ == 0 && key == uptimeKey;
     return add(key.size(), [&] { foundation::appendCborText(key, bytes_); });
 }
 

@@ -6,6 +6,7 @@
 
 #include "foundation/values/Value.h"
 #include "kesto/kesto.h"
+#include "wire/Stamps.h"
 
 #include <array>
 #include <cstddef>
@@ -38,6 +39,8 @@ public:
     // The entries, without the head of their map, and their number.
     [[nodiscard]] std::string_view entries() const noexcept { return bytes_; }
     [[nodiscard]] std::uint32_t entryCount() const noexcept { return containers_.front().count; }
+    // The stamps of that moment that the message does not have itself.
+    [[nodiscard]] Stamps missingStamps(Moment moment) const noexcept { return {moment, !hasTimestamp_, !hasUptime_}; }
 
 private:
     struct Container {
@@ -54,6 +57,8 @@ private:
     std::array<Container, KESTO_DEEPEST_NESTING + 1> containers_; // the first is the message itself
     std::size_t depth_ = 0; // of the innermost container that has not ended
     bool hasKey_ = false; // a key waits for its value
+    bool hasTimestamp_ = false; // the message itself has it, not a container in it
+    bool hasUptime_ = false;
     kesto_status failure_ = KESTO_OK;
 };
 

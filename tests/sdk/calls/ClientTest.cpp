@@ -43,7 +43,10 @@ protected:
 
 TEST_F(ClientTest, SendsEveryOperationAsTheProtocolHasIt)
 {
-    connect();
+    service_.emplace(path_);
+    kesto::Options unstamped = options();
+    unstamped.stamp = false;
+    ASSERT_EQ(client_.open(unstamped), Status::Ok);
     kesto::Message message;
     message.add("volume", 0.5).add("running", true);
     const Dictionary sent{{"volume", 0.5}, {"running", true}};
@@ -204,6 +207,7 @@ TEST_F(ClientTest, TakesCallsInCallbacks)
 TEST_F(ClientTest, GivesWhatTheStateCallbackSaysAheadOfWhatWasSentBefore)
 {
     kesto::Options given = options();
+    given.stamp = false;
     foundation::Mutex gate;
     kesto::Client client; // destroyed before the objects that its callback uses
     gate.lock();

@@ -14,6 +14,10 @@ class MailboxTest : public testing::Test {
 protected:
     bool send() { return mailbox_.putMessage(message_, {}, "entries"); }
     bool call(kesto_operation operation) { return mailbox_.putCall({.operation = operation}); }
+    bool play(kesto_operation operation, bool usesKeptRoom = true)
+    {
+        return mailbox_.putStreamRecord(operation, "record", "device", "encoding", usesKeptRoom);
+    }
 
     // Whether a call has rung since the last check.
     bool hasRung()
@@ -90,6 +94,46 @@ TEST_F(MailboxTest, AStartThatFindsNoRoomRingsForThoseWhoCountedOnIt)
     ASSERT_TRUE(mailbox_.fallAsleep());
     EXPECT_TRUE(send());
     EXPECT_TRUE(hasRung()) << "it is not counted as under way";
+}
+
+TEST_F(MailboxTest, RecordsOfStreamsRingOnlyIfTheThreadSleeps)
+{
+    EXPECT_TRUE(play(libkesto::streamStart));
+    EXPECT_TRUE(play(libkesto::streamOperation));
+    EXPECT_FALSE(hasRung());
+    takeAll();
+    ASSERT_TRUE(mailbox_.fallAsleep());
+    EXPECT_TRUE(play(libkesto::streamOperation));
+    EXPECT_TRUE(hasRung());
+    EXPECT_TRUE(play(libkesto::streamOperation));
+    EXPECT_FALSE(hasRung());
+}
+
+TEST_F(MailboxTest, MessagesWakeAThreadThatSleepsAfterItHasTakenTheStartOfAStream)
+{
+    EXPECT_TRUE(play(libkesto::streamStart));
+    takeAll();
+    ASSERT_TRUE(mailbox_.fallAsleep());
+    EXPECT_TRUE(send());
+    EXPECT_TRUE(hasRung());
+}
+
+TEST_F(MailboxTest, MessagesWakeAThreadThatSleepsAfterTheStartOfAStreamFoundNoRoom)
+{
+    while (play(libkesto::streamOperation)) { }
+    EXPECT_FALSE(play(libkesto::streamStart));
+    takeAll();
+    ASSERT_TRUE(mailbox_.fallAsleep());
+    EXPECT_TRUE(send());
+    EXPECT_TRUE(hasRung());
+}
+
+TEST_F(MailboxTest, OnlySomeRecordsOfStreamsUseTheRoomOfCalls)
+{
+    while (play(libkesto::streamOperation, false)) { }
+    EXPECT_FALSE(send());
+    EXPECT_TRUE(play(libkesto::streamOperation, true));
+    EXPECT_TRUE(call(KESTO_OPERATION_STOP_SESSION));
 }
 
 TEST_F(MailboxTest, CallsFindRoomWhenMessagesDoNotAnyMore)

@@ -1,5 +1,7 @@
-// The promises of `send`: counts, limits, many threads, no allocation, no system call.
+// The promises of `send`: counts, limits, many threads, no allocation, no system call. The last is also one of the
+// calls of playbacks.
 #include "kesto/kesto.hpp"
+#include "kesto/playback.hpp"
 #include "sdk/Allocations.h"
 #include "sdk/FakeService.h"
 #include "sdk/ServedClientTest.h"
@@ -98,6 +100,19 @@ TEST_F(SendTest, RefusesAMessageOfMoreThanAQuarterOfTheQueue)
     EXPECT_EQ(client_.flush(sdk_test::patience), Status::Ok);
     EXPECT_EQ(client_.send(small, Category::IO, EventType::Error, std::vector<kesto::ReporterID>(200, 1)),
               Status::TooLarge);
+}
+
+TEST_F(SendTest, CountsTheTimesThatItAddsAmongTheBytesOfAMessage)
+{
+    kesto::Options options;
+    options.queueBytes = 4096;
+    connect(sdk_test::answerObediently, options);
+    kesto::Message message;
+    message.add("text", std::string(810, 'x'));
+    ASSERT_EQ(message.size(), 818U);
+    EXPECT_EQ(send(message), Status::Ok);
+    message.clear().add("text", std::string(811, 'x'));
+    EXPECT_EQ(send(message), Status::TooLarge);
 }
 
 // If the queue has room, the frame is the limit, for any share of entries and reporters.
@@ -298,10 +313,90 @@ void forbidSystemCalls()
 
 constexpr std::uint64_t messagesWithoutSystemCalls = 20'000;
 
-// In a process of its own: makes a client and then, while system calls are forbidden, sends until so many messages are
-// answered. With a started session it sends as fast as the queue accepts. Without one it waits for each answer, so that
-// the client's thread goes to sleep in between.
-[[noreturn]] void sendWithoutSystemCalls(int serviceIsThere, const std::string& path, bool isStarted)
+void check(Status status)
+{
+    if (status != Status::Ok)
+        ::_exit(2);
+}
+
+// Sends messages until so many are answered. If it is to wait, it waits for each answer, so that the client's thread
+// goes to sleep in between; else it sends as fast as the queue accepts.
+void sendMessages(kesto::Client& client, bool waits)
+{
+    kesto::Message message;
+    message.reserve(1024);
+    forbidSystemCalls();
+    std::uint64_t queued = 0;
+    std::uint64_t answered = 0;
+    while (answered < messagesWithoutSystemCalls) {
+        answered = client.statistics().answered;
+        if (queued == messagesWithoutSystemCalls || (waits && answered < queued))
+            continue;
+        message.clear().add("number", queued).add("volume", 0.5).add("device", "Speaker");
+        queued += client.send(message, Category::Playback, EventType::Start, 42) == Status::Ok ? 1 : 0;
+    }
+}
+
+void sendWithASession(kesto::Client& client)
+{
+    client.createSession(42);
+    client.startSession(42);
+    sendMessages(client, false);
+}
+
+void sendWithoutASession(kesto::Client& client)
+{
+    client.createSession(42);
+    check(client.flush(sdk_test::patience));
+    sendMessages(client, true);
+}
+
+// Every call between start and stop.
+template <typename Stream> void change(Stream& stream, std::uint64_t round)
+{
+    stream.volume(static_cast<double>(round % 100) / 100);
+    stream.mute(round % 2 == 0);
+    stream.route(round % 2 == 0 ? "speaker" : "headset");
+    stream.format({"S16LE", static_cast<std::uint32_t>(round), 2});
+    stream.pause();
+    stream.resume();
+}
+
+void playWithASession(kesto::Client& client)
+{
+    client.createSession(42);
+    client.startSession(42);
+    kesto::Playback playback(client, "player", kesto::ServiceType::Test);
+    kesto::Recording recording(client, "recorder", kesto::ServiceType::Test);
+    check(client.flush(sdk_test::patience));
+    forbidSystemCalls();
+    for (std::uint64_t round = 0; client.statistics().answered < messagesWithoutSystemCalls; ++round) {
+        playback.start({"S16LE", 44100, 2}, "speaker");
+        recording.start();
+        change(playback, round);
+        change(recording, round);
+        playback.underrun(round, 0.5);
+        recording.overrun(round, 0.5);
+        playback.stop();
+        recording.stop();
+    }
+    ::syscall(SYS_exit_group, 0); // before they are freed, which a real-time thread leaves to others
+}
+
+void playAlone(kesto::Client& client)
+{
+    kesto::Playback playback(client, "player", kesto::ServiceType::Test);
+    check(playback.start());
+    forbidSystemCalls();
+    for (std::uint64_t round = 0; client.statistics().answered < messagesWithoutSystemCalls; ++round)
+        change(playback, round);
+    playback.stop();
+    ::syscall(SYS_exit_group, 0);
+}
+
+// In a process of its own: makes a client and reports with it, until the reporting is complete or makes a forbidden
+// system call.
+[[noreturn]] void reportInAChild(int serviceIsThere, const std::string& path, void (*report)(kesto::Client&))
 {
     ::alarm(static_cast<unsigned>(sdk_test::patience.count()));
     if (char go = 0; ::read(serviceIsThere, &go, 1) != 1)
@@ -311,29 +406,13 @@ constexpr std::uint64_t messagesWithoutSystemCalls = 20'000;
     options.socketPath = path;
     if (client.open(options) != Status::Ok)
         ::_exit(1);
-    client.createSession(42);
-    if (isStarted)
-        client.startSession(42);
-    else if (client.flush(sdk_test::patience) != Status::Ok)
-        ::_exit(2);
-    kesto::Message message;
-    message.reserve(1024);
-    forbidSystemCalls();
-    std::uint64_t queued = 0;
-    std::uint64_t answered = 0;
-    while (answered < messagesWithoutSystemCalls) {
-        answered = client.statistics().answered;
-        if (queued == messagesWithoutSystemCalls || (!isStarted && answered < queued))
-            continue;
-        message.clear().add("number", queued).add("volume", 0.5).add("device", "Speaker");
-        queued += client.send(message, Category::Playback, EventType::Start, 42) == Status::Ok ? 1 : 0;
-    }
+    report(client);
     ::syscall(SYS_exit_group, 0); // not _exit: with sanitizers it makes further system calls
     __builtin_unreachable();
 }
 
 // A process that is forked while it has only one thread, and a service for it.
-class SendWithoutSystemCalls : public testing::Test {
+class ReportingWithoutSystemCalls : public testing::Test {
 protected:
     void SetUp() override
     {
@@ -341,13 +420,13 @@ protected:
             GTEST_SKIP() << "the thread sanitizer makes system calls of its own whenever it sees a new atomic";
     }
 
-    int statusOfSending(bool isStarted)
+    int statusOf(void (*report)(kesto::Client&))
     {
         std::array<int, 2> ends{};
         EXPECT_EQ(::pipe(ends.data()), 0);
         const pid_t child = ::fork();
         if (child == 0)
-            sendWithoutSystemCalls(ends[0], path_, isStarted);
+            reportInAChild(ends[0], path_, report);
         service_.emplace(path_);
         EXPECT_EQ(::write(ends[1], "!", 1), 1);
         int status = 0;
@@ -362,17 +441,31 @@ protected:
     std::optional<FakeService> service_;
 };
 
-TEST_F(SendWithoutSystemCalls, IsWhatItDoesWhileASessionIsStarted)
+TEST_F(ReportingWithoutSystemCalls, IsWhatSendDoesWhileASessionIsStarted)
 {
-    const int status = statusOfSending(true);
+    const int status = statusOf(sendWithASession);
     EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "status " << status;
     EXPECT_GE(service_->waitForCalls(messagesWithoutSystemCalls).size(), messagesWithoutSystemCalls);
 }
 
-TEST_F(SendWithoutSystemCalls, IsNotWhatItDoesWhenTheThreadHasToBeWoken)
+TEST_F(ReportingWithoutSystemCalls, IsNotWhatSendDoesWhenTheThreadHasToBeWoken)
 {
-    const int status = statusOfSending(false);
+    const int status = statusOf(sendWithoutASession);
     EXPECT_TRUE(WIFSIGNALED(status) && WTERMSIG(status) == SIGSYS) << "status " << status;
+}
+
+TEST_F(ReportingWithoutSystemCalls, IsWhatEveryCallOfAPlaybackDoesWhileASessionIsStarted)
+{
+    const int status = statusOf(playWithASession);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "status " << status;
+    EXPECT_GE(service_->waitForCalls(messagesWithoutSystemCalls).size(), messagesWithoutSystemCalls);
+}
+
+TEST_F(ReportingWithoutSystemCalls, IsWhatAPlaybackDoesFromItsOwnStart)
+{
+    const int status = statusOf(playAlone);
+    EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "status " << status;
+    EXPECT_GE(service_->waitForCalls(messagesWithoutSystemCalls).size(), messagesWithoutSystemCalls);
 }
 
 } // namespace
