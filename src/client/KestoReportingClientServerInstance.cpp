@@ -30,9 +30,11 @@ KestoReportingClientServerInstance::KestoReportingClientServerInstance(
     std::uint32_t userIdentifier)
     : processIdentifier_(processIdentifier),
       userIdentifier_(userIdentifier),
+      logShare_(std::make_shared<platform::LogShare>(foundation::format("client {}", processIdentifier))),
       delegate_(std::move(delegate)),
       budget_(session::StorageBudget::makeForClient(userIdentifier))
 {
+    queue_->setLogShare(logShare_);
     KESTO_LOG(KestoReportingClientCategory(), Default, "new client with pid {}", processIdentifier_);
 }
 
@@ -43,6 +45,8 @@ KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
         platform::current().ledger.count(Counter::SessionsGone, clientReportingSessionMap_.size());
         platform::current().memory.clientGone();
     }
+    const platform::LogShare::Writing forNoShare(nullptr);
+    platform::reportLeftOutLines(*logShare_);
     if (sessionsRefused_ != 0)
         KESTO_LOG(KestoReportingClientCategory(), Error,
                   "client {} was refused {} sessions: it may have {}, and all clients {}", processIdentifier_,
@@ -94,15 +98,14 @@ KestoReportingClientServerInstance::findReportingSessionForID(std::int64_t repor
     return delegate ? delegate->findReportingSessionForID(reporterID) : nullptr;
 }
 
-void KestoReportingClientServerInstance::announceSource(platform::Turn& turn) const
+platform::SourceBegin KestoReportingClientServerInstance::sourceBegin() const
 {
-    utility::assertServerQueue();
     const foundation::Lock lock(registrationLock_);
-    turn.events.announce({.number = source_,
-                          .userIdentifier = userIdentifier_,
-                          .processIdentifier = processIdentifier_,
-                          .processName = clientProcessName_.value_or(std::string()),
-                          .time = clientStartDate_.value_or(0)});
+    return {.number = source_,
+            .userIdentifier = userIdentifier_,
+            .processIdentifier = processIdentifier_,
+            .processName = clientProcessName_.value_or(std::string()),
+            .time = clientStartDate_.value_or(0)};
 }
 
 void KestoReportingClientServerInstance::addSession(platform::Turn& turn, std::int64_t reporterID,
@@ -373,9 +376,11 @@ void KestoReportingClientServerInstance::handleConnectionError()
         if (!delegate || !isRegistered(*delegate, self))
             return;
         const auto started = std::make_shared<std::vector<Session>>();
-        for (const auto& entry : self.clientReportingSessionMap_)
+        for (const auto& entry : self.clientReportingSessionMap_) {
+            entry.session->announcePlayingEnd(turn, platform::PlayingEnding::Vanished);
             if (entry.session->started())
                 started->push_back(entry.session);
+        }
         std::ranges::reverse(*started);
         self.stopAll(turn, started);
     });
@@ -415,6 +420,7 @@ void KestoReportingClientServerInstance::leave(platform::Turn& turn)
         now.events.announceSourceEnd({self.source_, platform::current().clock.secondsSince1970()});
         if (const auto delegate = self.delegate_.lock())
             delegate->removeClient(self.shared_from_this());
+        const platform::LogShare::Writing forNoShare(nullptr); // of a client that flooded, too
         KESTO_LOG(KestoReportingClientCategory(), Default, "removing {} from the server client list",
                   self.processIdentifier_);
     });

@@ -49,8 +49,8 @@ public:
     [[nodiscard]] std::uint64_t source() const { return source_; }
     // The lane of the server queue for everything that this client causes. Any thread.
     [[nodiscard]] const std::shared_ptr<platform::Lane>& queue() const { return queue_; }
-    // Announces who is behind that number.
-    void announceSource(platform::Turn& turn) const;
+    // Who is behind that number. Any thread.
+    [[nodiscard]] platform::SourceBegin sourceBegin() const;
     // When the client was registered (seconds since 1970), and the name that it had then. Any thread.
     [[nodiscard]] std::optional<double> clientStartDate() const;
     void setClientStartDate(std::optional<double> date);
@@ -203,6 +203,7 @@ private:
     const std::int32_t processIdentifier_;
     const std::uint32_t userIdentifier_;
     const std::uint64_t source_ = platform::nextOriginNumber();
+    const std::shared_ptr<platform::LogShare> logShare_; // of everything that the client causes
     const std::shared_ptr<platform::Lane> queue_ = utility::serverQueue()->makeLane(userIdentifier_);
     std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);
     std::optional<std::string> clientProcessName_ KESTO_GUARDED_BY(registrationLock_);

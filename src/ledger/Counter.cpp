@@ -54,6 +54,13 @@ constexpr std::array<CounterRow, counterCount> makeRows()
          "look for errors of the disk in the kernel's log"},
         {Salvaged, "salvaged", Work, "", ""},
 
+        {StretchesKept, "stretches.kept", Work, "", ""},
+        {StretchesRemoved, "stretches.removed", Limit, "the events around them were too old or too many",
+         "raise maximum_age_days or maximum_size_mb in analytics.toml"},
+        {StretchesLeftOut, "stretches.leftOut", Limit,
+         "they took no time, or too many waited for a database that could not be written to",
+         "nothing, unless events are lost, too"},
+
         {ConnectionsAccepted, "connections.accepted", Work, "", ""},
         {ConnectionsRefused, "connections.refused.userLimit", Limit, "one user had too many connections",
          "let its programs share a connection, or raise LimitNOFILE of the service"},
@@ -119,6 +126,8 @@ constexpr std::array<CounterRow, counterCount> makeRows()
          "let the trace's parameters name fewer points"},
         {LogLinesLost, "log.lostLines", Limit, "the journal or the disk did not take them in time",
          "let the service log less"},
+        {LogLinesLeftOut, "log.leftOutLines", Limit, "a client made more log lines than its share",
+         "look for its number in the service's log"},
         {WorkLostToEnd, "work.lost.end", Loss, "the service had no time left for background work when it ended",
          "look for a disk that is slow or hangs"},
     }};

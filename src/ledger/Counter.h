@@ -49,6 +49,10 @@ enum class Counter : std::uint8_t {
     RemovedByDamage,
     Salvaged, // messages, from a damaged database; their events were kept before, and still are
 
+    StretchesKept, // rows about who played what for how long
+    StretchesRemoved,
+    StretchesLeftOut,
+
     ConnectionsAccepted,
     ConnectionsRefused,
     ConnectionsEnded,
@@ -95,6 +99,7 @@ enum class Counter : std::uint8_t {
     TraceIntervalsLost,
     TracePointsLost,
     LogLinesLost,
+    LogLinesLeftOut,
     WorkLostToEnd // captures, and other work in the background
 };
 inline constexpr std::size_t counterCount = static_cast<std::size_t>(Counter::WorkLostToEnd) + 1;

@@ -163,6 +163,7 @@ Dictionary report(const Ledger& ledger, const ServiceProcess& process, bool with
                   {"started", seconds(process.started)},
                   {"now", now(sinceStart)},
                   {"rates", Dictionary{{"deliveries", deliveries}, {"events", events}}},
+                  {"storing", process.isStoring()},
                   {"memory", memory(process.memory())}},
                  ledger.account(), withCulprits, countsOfRun(ledger, sinceStart, withCulprits));
 }
@@ -175,6 +176,7 @@ Dictionary report(const Account& account, bool withCulprits)
                   {"started", {}},
                   {"now", {}},
                   {"rates", {}},
+                  {"storing", {}},
                   {"memory", {}}},
                  account, withCulprits, {});
 }

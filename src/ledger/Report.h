@@ -26,6 +26,7 @@ struct ServiceProcess {
     std::string_view version;
     bool isInternalBuild = false;
     double started = 0; // seconds since 1970
+    bool (*isStoring)() = [] { return true; }; // whether it stores any events
     MemoryState (*memory)() = [] { return MemoryState(); };
 };
 

@@ -5,6 +5,8 @@
 // platform's log decides where the line goes.
 #pragma once
 
+#include "platform/LogShare.h"
+
 #include <atomic>
 #include <cstdint>
 #include <fmt/core.h>
@@ -88,7 +90,11 @@ public:
 // The prefix that every line starts with: the name right-aligned in 25 columns, the line left-aligned in 5.
 [[nodiscard]] std::string logPrefix(const LogLocation& location);
 
-// Formats the message and hands it to the current platform's log.
+// Writes how many lines of the share were left out since the last report. For the end of its client.
+void reportLeftOutLines(LogShare& share);
+
+// Formats the message and hands it to the current platform's log, unless the calling thread writes for a share that has
+// no line left.
 void writeFormattedLog(const LogCategory& category, LogLevel level, LogLocation location, fmt::string_view format,
                        fmt::format_args arguments);
 

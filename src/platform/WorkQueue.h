@@ -17,6 +17,7 @@
 #pragma once
 
 #include "ledger/Workload.h"
+#include "platform/LogShare.h"
 #include "platform/Turn.h"
 
 #include <chrono>
@@ -79,6 +80,9 @@ public:
 
     // From now on the time that the lane's items take counts there. Any thread.
     virtual void setWorkload(std::shared_ptr<ledger::Workload> workload) = 0;
+
+    // From now on the lane's items write to the log for that share. Set it before the first item.
+    virtual void setLogShare(std::shared_ptr<LogShare> share) = 0;
 
     // Continues a lane that pauses: its next item is this one, as by `submitLong`. Any thread.
     using Resume = std::move_only_function<void(TurnItem item)>;

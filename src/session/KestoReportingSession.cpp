@@ -140,6 +140,7 @@ void KestoReportingSession::setOwner(std::uint64_t source)
 platform::Origin KestoReportingSession::announcedOrigin(platform::Turn& turn)
 {
     utility::assertServerQueue();
+    mayPlay_ = origin_.session != 0;
     if (origin_.session == 0 || std::exchange(isAnnounced_, true))
         return origin_;
     wasAnnounced_ = true;
@@ -158,6 +159,13 @@ void KestoReportingSession::announceEnd(platform::Turn& turn)
     utility::assertServerQueue();
     if (std::exchange(wasAnnounced_, false))
         turn.events.announceSessionEnd({origin_.session, platform::current().clock.secondsSince1970()});
+}
+
+void KestoReportingSession::announcePlayingEnd(platform::Turn& turn, platform::PlayingEnding ending)
+{
+    utility::assertServerQueue();
+    if (std::exchange(mayPlay_, false))
+        turn.events.announcePlayingEnd(origin_.session, platform::current().clock.secondsSince1970(), ending);
 }
 
 void KestoReportingSession::setDriverSnapShot(std::optional<session::DriverSnapShot> snapShot)

@@ -56,6 +56,8 @@ public:
     [[nodiscard]] platform::Origin announcedOrigin(platform::Turn& turn) override;
     // Announces that it gets no more messages, if the store knows it.
     void announceEnd(platform::Turn& turn);
+    // Announces that it plays nothing any more, if the store got an event of it since the last time.
+    void announcePlayingEnd(platform::Turn& turn, platform::PlayingEnding ending);
 
     void setServiceType(AudioServiceType type);
     [[nodiscard]] AudioServiceType serviceType() const override { return serviceType_; }
@@ -199,6 +201,7 @@ private:
     platform::Origin origin_;
     double created_ = 0; // seconds since 1970
     bool isAnnounced_ = false; // as it is now
+    bool mayPlay_ = false; // for all that the store knows
     bool wasAnnounced_ = false;
     std::optional<std::string> tracingFileName_;
     std::unique_ptr<TraceParams> traceParams_;

@@ -105,6 +105,35 @@ TEST_F(LogTest, ThreadsMayMeetACategoryForTheFirstTimeTogether)
     EXPECT_EQ(platform_.log.take().size(), 4U);
 }
 
+TEST_F(LogTest, AThreadThatWritesForAShareLeavesOutWhatGoesBeyondIt)
+{
+    LogShare share("client 7");
+    {
+        const LogShare::Writing writing(&share);
+        for (int line = 0; line < 10'000; ++line)
+            KESTO_LOG(category_, Default, "again");
+        KESTO_LOG(category_, Error, "an error has a part of its own");
+    }
+    KESTO_LOG(category_, Default, "for no share");
+    const auto lines = platform_.log.take();
+    const auto written = static_cast<std::uint64_t>(std::ranges::count(lines, "again", &support::LogLine::message));
+    const std::uint64_t leftOut = platform_.ledger.account()[ledger::Counter::LogLinesLeftOut];
+    EXPECT_GE(written, 2000U);
+    EXPECT_LT(written, 5000U) << "a minute's";
+    EXPECT_EQ(written + leftOut, 10'000U);
+    EXPECT_THAT(lines, testing::Contains(IsLine(LogLevel::Error, "test", "an error has a part of its own")));
+    EXPECT_THAT(lines, testing::Contains(IsLine(LogLevel::Default, "test", "for no share")));
+
+    EXPECT_THAT(lines,
+                testing::Contains(IsLine(LogLevel::Error, "log",
+                                         fmt::format("client 7 made too many log lines: {} were left out; it may "
+                                                     "have 2000 at once and 50 a second",
+                                                     leftOut))))
+        << "reported with the next line that is written";
+    reportLeftOutLines(share);
+    EXPECT_THAT(platform_.log.take(), testing::IsEmpty());
+}
+
 // A category must neither ask an uninstalled log for a threshold nor keep one without a log.
 TEST(LogWithoutPlatform, DropsStatementsAndRemembersNothing)
 {

@@ -130,6 +130,30 @@ TEST_F(SessionTest, HoldsWhatItsClientInstanceKeepsInIt)
     EXPECT_EQ(session->driverSnapShot(), std::nullopt);
 }
 
+// --- What the store knows of it
+
+TEST_F(SessionTest, TheEndOfPlayingIsAnnouncedOnceBehindTheEventsOfASessionThatTheStoreKnows)
+{
+    using platform::PlayingEnding;
+    const auto ends = [this] { return platform.turn.events.announcements().playingEnds.size(); };
+    session->announcePlayingEnd(platform.turn, PlayingEnding::Stopped);
+    (void)session->announcedOrigin(platform.turn);
+    session->announcePlayingEnd(platform.turn, PlayingEnding::Stopped);
+    EXPECT_EQ(ends(), 0U) << "it has no owner yet";
+    session->setOwner(3);
+    session->announcePlayingEnd(platform.turn, PlayingEnding::Stopped);
+    EXPECT_EQ(ends(), 0U) << "the store got no event of it";
+    const platform::Origin origin = session->announcedOrigin(platform.turn);
+    session->announcePlayingEnd(platform.turn, PlayingEnding::Vanished);
+    session->announcePlayingEnd(platform.turn, PlayingEnding::Stopped);
+    ASSERT_EQ(ends(), 1U);
+    EXPECT_EQ(platform.turn.events.announcements().playingEnds[0].session, origin.session);
+    EXPECT_EQ(platform.turn.events.announcements().playingEnds[0].ending, PlayingEnding::Vanished);
+    (void)session->announcedOrigin(platform.turn);
+    session->announcePlayingEnd(platform.turn, PlayingEnding::Stopped);
+    EXPECT_EQ(ends(), 2U);
+}
+
 // --- description
 
 TEST_F(SessionTest, DescribesItself)

@@ -69,6 +69,7 @@ public:
         releaseHandler_ = std::move(handler);
     }
     void setWorkload(std::shared_ptr<ledger::Workload>) override { } // its items take no time
+    void setLogShare(std::shared_ptr<platform::LogShare>) override { }
     [[nodiscard]] Resume pause() override
     {
         isPausing_ = true;

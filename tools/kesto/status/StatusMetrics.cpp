@@ -93,6 +93,9 @@ std::string metricsText(const Dictionary& report)
         appendProcess(report, text);
     appendGauge("kesto_counting_since_seconds", "When the counting began, in seconds since 1970.",
                 ledger::numberIn(report, "began"), text);
+    if (const auto* const storing = report.find("storing"); storing != nullptr && !storing->isNull())
+        appendGauge("kesto_store_enabled", "1 while events are stored, 0 while analytics.toml says enabled = false.",
+                    storing->asBoolean() ? 1 : 0, text);
     appendGauge("kesto_store_events", "Events in the store.", ledger::numberIn(report, "store.events"), text);
     appendGauge("kesto_store_size_bytes", "The size of the store's files.", ledger::numberIn(report, "store.bytes"),
                 text);

@@ -85,6 +85,9 @@ private:
         const std::uint64_t oldest = numberIn(report_, "store.oldest");
         addLine(fmt::format("the store has {} in {}{}", counted("store.events", "event"), size("store.bytes"),
                             oldest == 0 ? "" : ", the oldest of " + moment(oldest)));
+        if (const auto* const storing = report_.find("storing");
+            isRunning_ && storing != nullptr && !storing->asBoolean())
+            addLine("no event is stored: analytics.toml says enabled = false");
     }
 
     void addRow(std::string_view name, std::string_view ofRun, std::string_view ofAll, std::string_view rest = {})

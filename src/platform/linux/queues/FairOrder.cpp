@@ -28,6 +28,7 @@ struct FairOrder::Lane : FairShares::Share {
     std::shared_ptr<const RoomHandler> roomHandler;
     ReleaseHandler releaseHandler;
     std::shared_ptr<ledger::Workload> workload; // null: its time is not counted
+    std::shared_ptr<LogShare> logShare; // null: it may write all lines
 
     void release();
 };
@@ -108,6 +109,11 @@ void FairOrder::setWorkload(Lane& lane, std::shared_ptr<ledger::Workload> worklo
     lane.workload = std::move(workload);
 }
 
+void FairOrder::setLogShare(Lane& lane, std::shared_ptr<LogShare> share)
+{
+    lane.logShare = std::move(share);
+}
+
 void FairOrder::Lane::release()
 {
     const std::uint64_t ran = added - items.size() - (isPausing ? 1 : 0); // the item that paused goes on
@@ -135,6 +141,11 @@ std::shared_ptr<const FairOrder::RoomHandler> FairOrder::take(std::vector<Item>&
         return nullptr;
     lane.wantsRoom = false;
     return lane.roomHandler;
+}
+
+LogShare* FairOrder::logShare() const
+{
+    return static_cast<const Lane&>(shares_.first()).logShare.get();
 }
 
 void FairOrder::charge(Duration time)

@@ -40,6 +40,8 @@ public:
     static void setReleaseHandler(Lane& lane, ReleaseHandler handler);
     // The time of the lane's items counts there, too.
     static void setWorkload(Lane& lane, std::shared_ptr<ledger::Workload> workload);
+    // The lane's items write to the log for that share.
+    static void setLogShare(Lane& lane, std::shared_ptr<LogShare> share);
 
     // The lane's items no longer wait, until `resume` makes this item its first. The lane must be the one that is being
     // served, and its item must have come alone.
@@ -59,6 +61,8 @@ public:
     // that may take long comes alone. `charge` must be called before the next call of this. Returns the lane's handler
     // if it was full and has room again.
     [[nodiscard]] std::shared_ptr<const RoomHandler> take(std::vector<Item>& items, std::size_t most);
+    // For whose share the items that were taken last write to the log; null: for none. Valid until `charge`.
+    [[nodiscard]] LogShare* logShare() const;
     // What was taken last has run, and took so long.
     void charge(Duration time);
 

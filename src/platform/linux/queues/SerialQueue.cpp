@@ -59,6 +59,12 @@ public:
         FairOrder::setWorkload(lane, std::move(workload));
     }
 
+    void setLogShare(FairOrder::Lane& lane, std::shared_ptr<LogShare> share)
+    {
+        const foundation::Lock lock(lock_);
+        FairOrder::setLogShare(lane, std::move(share));
+    }
+
     void pause(FairOrder::Lane& lane)
     {
         assert(isCurrent());
@@ -206,16 +212,22 @@ private:
                 return leaveTurn();
             if (const auto tellOfRoom = std::exchange(roomHandler_, nullptr))
                 (*tellOfRoom)();
-            for (FairOrder::Item& item : items_) {
-                item.run(turn_);
-                item.run = nullptr; // what it holds is released before the next one runs
-            }
+            runItems();
             const auto now = Clock::now();
             itemsTime_ = now - std::exchange(begin, now);
         }
         if (runner == Runner::Helper && turnEnd_.wouldWait && turnEnd_.wouldWait())
             return leaveTurn();
         endTurn();
+    }
+
+    void runItems()
+    {
+        const LogShare::Writing writing(logShare_);
+        for (FairOrder::Item& item : items_) {
+            item.run(turn_);
+            item.run = nullptr; // what it holds is released before the next one runs
+        }
     }
 
     // Takes the items that run next.
@@ -233,6 +245,7 @@ private:
         if (runner == Runner::Helper && order_.front().mayTakeLong)
             return Next::Leave;
         roomHandler_ = order_.take(items_, leftInTurn_);
+        logShare_ = order_.logShare();
         leftInTurn_ -= items_.size();
         takenInTurn_ += items_.size();
         return Next::Run;
@@ -276,6 +289,7 @@ private:
     Turn turn_;
     std::vector<FairOrder::Item> items_; // that run now
     std::shared_ptr<const FairOrder::RoomHandler> roomHandler_; // of their lane, if it has room again
+    LogShare* logShare_ = nullptr; // of their lane
     std::chrono::nanoseconds itemsTime_{};
     std::chrono::nanoseconds turnTime_{};
     std::size_t leftInTurn_ = 0; // items that waited when it began, and may run in it
@@ -320,6 +334,7 @@ public:
     {
         work_->setWorkload(*lane_, std::move(workload));
     }
+    void setLogShare(std::shared_ptr<LogShare> share) override { work_->setLogShare(*lane_, std::move(share)); }
     [[nodiscard]] Resume pause() override
     {
         work_->pause(*lane_);

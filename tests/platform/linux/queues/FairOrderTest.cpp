@@ -300,6 +300,23 @@ TEST_F(FairOrderTest, CountsTheTimeOfALaneInItsWorkload)
     EXPECT_EQ(workload->work(), (ledger::Work{.calls = 0, .time = 6ms, .bytes = 0}));
 }
 
+TEST_F(FairOrderTest, SaysForWhoseShareOfTheLogALanesItemsWrite)
+{
+    const auto share = std::make_shared<LogShare>("client 7");
+    const Lane lane = order.makeLane(alice);
+    const Lane other = order.makeLane(bob);
+    FairOrder::setLogShare(*lane, share);
+    addMany(lane, "a", 1);
+    addMany(other, "b", 1);
+    std::vector<FairOrder::Item> items;
+    std::ignore = order.take(items, 10);
+    EXPECT_EQ(order.logShare(), share.get());
+    order.charge(1ms);
+    std::ignore = order.take(items, 10);
+    EXPECT_EQ(order.logShare(), nullptr);
+    order.charge(1ms);
+}
+
 TEST_F(FairOrderTest, ReleasesAtOnceWhatItemsHeldThatHaveRunAlready)
 {
     const Lane lane = order.makeLane(alice);

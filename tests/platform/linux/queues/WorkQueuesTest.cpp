@@ -458,6 +458,21 @@ TEST_F(LanesTest, TheTimeThatItsItemsTakeCountsInALanesWorkload)
     EXPECT_EQ(idle->work().time, 0ms);
 }
 
+TEST_F(LanesTest, ItsItemsWriteToTheLogForTheirLanesShare)
+{
+    const auto share = std::make_shared<LogShare>("client 7");
+    const auto lane = queue->makeLane(1000);
+    const auto other = queue->makeLane(1000);
+    lane->setLogShare(share);
+    LogShare* ofLane = nullptr;
+    LogShare* ofOther = share.get();
+    lane->submit([&] { ofLane = LogShare::ofThisThread(); });
+    other->submit([&] { ofOther = LogShare::ofThisThread(); });
+    queue.reset();
+    EXPECT_EQ(ofLane, share.get());
+    EXPECT_EQ(ofOther, nullptr);
+}
+
 TEST_F(LanesTest, AFullLaneSaysOnceWhenItHasRoomAgain)
 {
     const auto lane = queue->makeLane(1000);

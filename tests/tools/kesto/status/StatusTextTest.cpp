@@ -107,6 +107,18 @@ TEST_F(StatusText, NamesThoseWhoTakeTheTimeAndSumsUpTheOthers)
     EXPECT_THAT(statusText(running(), std::string::npos), Not(HasSubstr("TIME TAKEN")));
 }
 
+TEST_F(StatusText, SaysThatNothingIsStored)
+{
+    constexpr std::string_view line = "\nno event is stored: analytics.toml says enabled = false\n";
+    EXPECT_THAT(statusText(running(), std::string::npos), Not(HasSubstr(line)));
+    ledger::ServiceProcess silent = process;
+    silent.isStoring = [] { return false; };
+    const Dictionary report = ledger::report(*ledger, silent, false);
+    EXPECT_THAT(statusText(report, std::string::npos), HasSubstr(line));
+    EXPECT_THAT(metricsText(report), HasSubstr("\nkesto_store_enabled 0\n"));
+    EXPECT_THAT(metricsText(running()), HasSubstr("\nkesto_store_enabled 1\n"));
+}
+
 TEST_F(StatusText, SaysThatTheServiceDoesNotRun)
 {
     const std::string text = statusText(ledger::report(*accountIn(image), false), std::string::npos);
