@@ -38,7 +38,7 @@ BusMessage sampleCall(sd_bus* bus, std::uint32_t number)
     BusMessage owner(call);
     check(::sd_bus_message_append(call, "a{sv}uqax", 10, //
                                   "session_output_running", "b", 1, //
-                                  "session_selected_format", "s", "lpcm, 48 kHz, 24 bit", //
+                                  "session_selected_format", "s", "S24LE/48000/2", //
                                   "mChannelsPerFrame", "x", std::int64_t{2}, //
                                   "active_devices", "s", "Built-in Speakers", //
                                   "PomoSessionVolume", "d", 0.8125, //

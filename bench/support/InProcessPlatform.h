@@ -72,6 +72,7 @@ private:
         void setRoomHandler(std::function<void()>) override { }
         void setReleaseHandler(std::function<void(std::size_t)>) override { }
         void setWorkload(std::shared_ptr<ledger::Workload>) override { }
+        void setLogShare(std::shared_ptr<platform::LogShare>) override { }
         [[nodiscard]] Resume pause() override
         {
             return [this](platform::TurnItem item) { submit(std::move(item)); };
@@ -144,11 +145,12 @@ private:
         std::uint64_t state_ = 0;
     };
     class Analytics final : public platform::Analytics {
+        [[nodiscard]] bool isEnabled() const override { return true; }
         [[nodiscard]] bool isAnalyticsEventUsed(std::string_view) override { return false; }
         void sendAnalyticsEventLazy(platform::Turn&, const platform::Origin&, std::string_view, PayloadBuilder) override
         {
         }
-        void sendAnalyticsEventLazy(platform::OutsideTurn, const platform::Origin&, std::string_view,
+        void sendAnalyticsEventLazy(platform::OutsideTurn, const platform::SourceBegin&, std::string_view,
                                     PayloadBuilder) override
         {
         }

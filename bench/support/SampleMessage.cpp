@@ -7,7 +7,7 @@ foundation::Dictionary sampleMessage(std::uint32_t number)
 {
     static const foundation::Dictionary message{
         {"session_output_running", true},
-        {"session_selected_format", "lpcm, 48 kHz, 24 bit"},
+        {"session_selected_format", "S24LE/48000/2"},
         {"mChannelsPerFrame", 2},
         {"active_devices", "Built-in Speakers"},
         {"PomoSessionVolume", 0.8125},

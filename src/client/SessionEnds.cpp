@@ -16,6 +16,7 @@ void SessionEnds::stop(platform::Turn& turn, std::shared_ptr<KestoReportingSessi
                        const std::shared_ptr<platform::Lane>& lane, Then then)
 {
     utility::assertServerQueue();
+    session->announcePlayingEnd(turn, platform::PlayingEnding::Stopped);
     if (!session->takesLongToStop()) {
         session->stop(turn);
         session.reset(); // `then` may be what lets go of it

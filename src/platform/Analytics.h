@@ -16,6 +16,8 @@ public:
     using PayloadBuilder = std::move_only_function<foundation::Dictionary()>;
 
     virtual ~Analytics() = default;
+    // Whether the device keeps any events now.
+    [[nodiscard]] virtual bool isEnabled() const = 0;
     // Whether the device keeps events of that name now.
     [[nodiscard]] virtual bool isAnalyticsEventUsed(std::string_view eventName) = 0;
     // Sends an event. The events of a turn are stored together when it ends; an event outside any turn is stored as
@@ -23,10 +25,11 @@ public:
     // turns. The service calls the builder at most once, on any thread, when it needs the payload. It drops an unwanted
     // event with its builder, and loses an event with a number that is not finite in its payload.
     //
-    // The origin is one that a turn's batch announced (see EventBatch), or none.
+    // The origin is one that a turn's batch announced (see EventBatch), or none. Outside a turn, the source comes with
+    // the event, because the turn that announces it may still run; one without a number is none.
     virtual void sendAnalyticsEventLazy(Turn& turn, const Origin& origin, std::string_view eventName,
                                         PayloadBuilder payloadBuilder) = 0;
-    virtual void sendAnalyticsEventLazy(OutsideTurn, const Origin& origin, std::string_view eventName,
+    virtual void sendAnalyticsEventLazy(OutsideTurn, const SourceBegin& source, std::string_view eventName,
                                         PayloadBuilder payloadBuilder) = 0;
     // Logs the losses of events that the log does not show yet. Never waits for the disk.
     virtual void reportLosses() = 0;

@@ -10,9 +10,11 @@
 
 #include "foundation/values/Value.h"
 #include "platform/Origin.h"
+#include "platform/PlayingFacts.h"
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <optional>
 #include <span>
 #include <string>
@@ -22,9 +24,6 @@
 
 namespace platform {
 
-// The key under which a message says when it happened, in seconds since 1970 UTC.
-inline constexpr std::string_view timestampKey = "kestoreporting_timestamp";
-
 // One message in its stored form: an event, or two with the same payload.
 struct EventRow {
     double time = 0; // when the service sent it; seconds since 1970 UTC, as below
@@ -33,6 +32,8 @@ struct EventRow {
     std::string_view name;
     std::string_view secondName; // empty: one event
     std::string_view payload; // JSON
+    const PlayingFacts* playing = nullptr; // null: the payload says nothing about playing
+    std::size_t place = 0; // its number in the batch, from 0
 
     [[nodiscard]] std::uint64_t events() const noexcept { return secondName.empty() ? 1 : 2; }
 };
@@ -45,9 +46,14 @@ public:
     // In bytes of memory, roughly: a payload that takes more waits.
     static constexpr std::size_t largestWrittenAtOnce = 64 * 1024;
 
+    // The payload as it may be stored; nothing if the event may not be stored at all.
+    using PayloadFilter = std::function<std::optional<foundation::Dictionary>(const foundation::Dictionary& payload)>;
+
     // The time is in seconds since 1970 UTC. An event with the payload object and the origin of the one before it, but
-    // another name, is the second event of the same message, and has its time. A name is not empty.
-    void add(double time, const Origin& origin, std::string_view name, const foundation::Dictionary& payload);
+    // another name, is the second event of the same message, and has its time. A name is not empty. False if the filter
+    // keeps the event out.
+    bool add(double time, const Origin& origin, std::string_view name, const foundation::Dictionary& payload,
+             const PayloadFilter& filter = {});
     void add(double time, std::string_view name, const foundation::Dictionary& payload)
     {
         add(time, {}, name, payload);
@@ -57,6 +63,11 @@ public:
     void announce(SessionBegin begin);
     void announceSourceEnd(OriginEnd end) { announcements_.sourceEnds.push_back(end); }
     void announceSessionEnd(OriginEnd end) { announcements_.sessionEnds.push_back(end); }
+    // Says that a session plays nothing any more, behind the messages that were added so far.
+    void announcePlayingEnd(std::uint64_t session, double time, PlayingEnding ending)
+    {
+        announcements_.playingEnds.push_back({session, time, ending, messages_.size()});
+    }
 
     // Puts the events of the other behind these; it is then empty.
     void takeFrom(EventBatch& other);
@@ -75,6 +86,7 @@ public:
     // Of all events. Also while another thread calls `rows`.
     [[nodiscard]] EventsByOrigin eventsByOrigin() const;
     [[nodiscard]] const OriginAnnouncements& announcements() const noexcept { return announcements_; }
+    [[nodiscard]] OriginAnnouncements& announcements() noexcept { return announcements_; }
 
 private:
     struct Text { // in `texts_`
@@ -83,7 +95,6 @@ private:
     };
     struct Message {
         double time;
-        std::optional<double> happened;
         Origin origin;
         Text name;
         Text secondName;
@@ -91,20 +102,31 @@ private:
 
         [[nodiscard]] std::uint64_t events() const noexcept { return secondName.size == 0 ? 1 : 2; }
     };
+    struct Facts {
+        PlayingFacts playing; // its texts point to where they stand now only in the results of `rows`
+        Text devices;
+        Text format;
+    };
+    static constexpr std::size_t noFacts = static_cast<std::size_t>(-1);
     struct Payload {
         Text json; // empty where there is none
+        std::optional<double> happened;
+        std::size_t facts; // its place in `facts_`, or `noFacts`
         foundation::Dictionary waiting; // becomes JSON in `rows`
     };
 
     [[nodiscard]] bool isSecondEventOfLast(const Origin& origin, std::string_view name) const;
+    [[nodiscard]] bool addPayload(const foundation::Dictionary& payload, const PayloadFilter& filter);
     void addPayload(const foundation::Dictionary& payload);
     [[nodiscard]] Text append(std::string_view text);
     [[nodiscard]] Text write(const foundation::Dictionary& payload);
+    [[nodiscard]] std::size_t addFacts(const PlayingFacts& playing);
     [[nodiscard]] std::string_view view(const Text& text) const;
 
     std::size_t events_ = 0;
     std::vector<Message> messages_;
     std::vector<Payload> payloads_;
+    std::vector<Facts> facts_;
     foundation::Dictionary lastPayload_; // both events of a message share one
     std::string texts_;
     std::size_t waitingBytes_ = 0;

@@ -61,16 +61,31 @@ struct OriginEnd {
     friend bool operator==(const OriginEnd&, const OriginEnd&) = default;
 };
 
-// What one batch announces. The begins count before its events, the ends after them.
+// A session plays and records nothing any more, although it may begin again.
+enum class PlayingEnding : std::uint8_t {
+    Stopped, // the client stopped it
+    Vanished // its connection ended
+};
+struct PlayingEnd {
+    std::uint64_t session = 0; // its number
+    double time = 0;
+    PlayingEnding ending = PlayingEnding::Stopped;
+    std::size_t place = 0; // behind so many messages of its batch
+
+    friend bool operator==(const PlayingEnd&, const PlayingEnd&) = default;
+};
+
+// What one batch announces. The begins count before its events, the ends after them, except for those of playing.
 struct OriginAnnouncements {
     std::vector<SourceBegin> sources;
     std::vector<SessionBegin> sessions;
     std::vector<OriginEnd> sourceEnds;
     std::vector<OriginEnd> sessionEnds;
+    std::vector<PlayingEnd> playingEnds; // in their order
 
     [[nodiscard]] bool empty() const noexcept
     {
-        return sources.empty() && sessions.empty() && sourceEnds.empty() && sessionEnds.empty();
+        return sources.empty() && sessions.empty() && sourceEnds.empty() && sessionEnds.empty() && playingEnds.empty();
     }
 };
 

@@ -78,7 +78,7 @@ void KestoReportingServiceDelegate::registerClient(platform::Turn& turn,
     client->setClientStartDate(platform::current().clock.secondsSince1970());
     platform::current().processTable.forget(client->processIdentifier()); // an earlier process may have had the number
     client->setClientProcessName(KestoReportingUtilityProcessNameForPID(client->processIdentifier()));
-    client->announceSource(turn);
+    turn.events.announce(client->sourceBegin());
 }
 
 void KestoReportingServiceDelegate::removeClient(const std::shared_ptr<KestoReportingClientServerInstance>& client)

@@ -76,6 +76,6 @@ void KestoReportingServiceDelegate::handleInvalidation(
         return;
     }
     platform::current().analytics.sendAnalyticsEventLazy(
-        platform::outsideTurn, {.source = client->source(), .session = 0}, "com.quarn.kesto.kestoreportingclientuptime",
+        platform::outsideTurn, client->sourceBegin(), "com.quarn.kesto.kestoreportingclientuptime",
         [name = *processName, uptime] { return foundation::Dictionary{{"processName", name}, {"seconds", uptime}}; });
 }

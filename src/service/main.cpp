@@ -1,5 +1,5 @@
 // kestod: puts the service object on the Linux platform and gives the main thread to the listener, until a signal ends
-// the process. It has no command line; the launch configuration is in the environment.
+// the process. The launch configuration is in the environment; on its command line it only answers who it is.
 #include "ledger/Report.h"
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/LinuxPlatform.h"
@@ -27,6 +27,36 @@ int cannotRun(const std::string& reason)
 {
     std::fputs(("kestod: " + reason + "\n").c_str(), stderr);
     return platform::LaunchConfiguration::exitStatus;
+}
+
+constexpr const char* help = R"(Usage: kestod [--help | --version]
+
+The Kesto reporting service: takes reports about the use of audio on a Unix socket and stores them.
+It runs until a signal ends it, takes no other arguments, and is best started by systemd:
+
+  systemctl enable --now kestod.socket            for the system
+  systemctl --user enable --now kestod.socket     for one user
+
+Without systemd, its environment names what it needs:
+
+  RUNTIME_DIRECTORY         where its socket is made
+  STATE_DIRECTORY           where it stores events
+  LOGS_DIRECTORY            where it writes summaries and traces
+  CONFIGURATION_DIRECTORY   where its configuration is; may be missing
+  KESTO_SERVICE_NAME        the name of the socket: com.quarn.kesto.reporting
+  KESTO_LOG                 what it logs: error, default, info or debug
+
+See kestod(8). What it stored shows kesto(1).
+)";
+
+int answer(std::string_view argument)
+{
+    if (argument == "--version")
+        return std::puts("kestod " KESTO_VERSION) < 0;
+    if (argument == "--help" || argument == "-h")
+        return std::fputs(help, stdout) < 0;
+    return cannotRun("it takes no argument but --help and --version, not " + std::string(argument)
+                     + "; its configuration is in its environment");
 }
 
 std::expected<platform::ListeningSocket, std::string> takeSocket(platform::LaunchConfiguration& launch)
@@ -92,6 +122,7 @@ int run()
     const ledger::ServiceProcess process{.version = KESTO_VERSION,
                                          .isInternalBuild = KestoReportingUtilityIsInternalBuild(),
                                          .started = platform.platform().clock.secondsSince1970(),
+                                         .isStoring = [] { return platform::current().analytics.isEnabled(); },
                                          .memory = memoryState};
     (*listener)->setStatus([&ledger = platform.platform().ledger, process](bool withCulprits) {
         return ledger::report(ledger, process, withCulprits);
@@ -100,7 +131,10 @@ int run()
     if (platform::hasServiceManager())
         service::StatusNotifier::start(platform.platform().ledger, platform.platform().clock,
                                        platform.platform().workQueues, process, platform::notifyStatus);
-    (*listener)->setStoppedHandler([&endSignals] { logEnd(*endSignals.request()); });
+    (*listener)->setStoppedHandler([&endSignals, &platform] {
+        platform.analyticsStore().beginEnd();
+        logEnd(*endSignals.request());
+    });
     endSignals.setHandlers({.begin = [&target = **listener] { target.stop(); },
                             .giveUp =
                                 [&platform](std::string_view reason) {
@@ -112,8 +146,10 @@ int run()
 
 } // namespace
 
-int main()
+int main(int argumentCount, char** arguments)
 {
+    if (argumentCount > 1)
+        return answer(arguments[1]);
     std::signal(SIGPIPE, SIG_IGN); // the log's reader may end; the service goes on
     try {
         return run();

@@ -538,6 +538,29 @@ TEST_P(EndUnderLoadTest, WhatWasAnsweredIsCountedAndKept)
 INSTANTIATE_TEST_SUITE_P(Ends, EndUnderLoadTest, testing::Values(End::BySigkill, End::ByKillService, End::BySigterm),
                          [](const auto& test) { return nameOf(test.param); });
 
+TEST(FloodedLogTest, AClientThatCallsTooOftenLosesItsOwnLinesOnly)
+{
+    Kestod kestod({}, {{"KESTO_LOG", "default"}});
+    kestod.startAndAwait();
+    constexpr int calls = 10'000;
+    {
+        WireClient flooding(kestod.socketPath());
+        flooding.ask(Create, 1);
+        for (int call = 0; call < calls; ++call)
+            flooding.call(Validate, 1);
+        for (int call = 0; call < calls; ++call)
+            ASSERT_TRUE(flooding.nextReply());
+    }
+    EXPECT_TRUE(waitUntil([&] { return kestod.countInLog("made too many log lines") != 0; }));
+    WireClient(kestod.socketPath()).ask(Validate, 4711);
+    kestod.awaitLog();
+    const std::size_t written = kestod.countInLog("validating reporter 1\n");
+    EXPECT_GE(written, 1990U) << "its first lines are others";
+    EXPECT_LT(written, 5000U);
+    EXPECT_EQ(readLedger(kestod)[Counter::LogLinesLeftOut], calls - written);
+    EXPECT_EQ(kestod.countInLog("validating reporter 4711\n"), 1U);
+}
+
 TEST(BlockedLogTest, CallsAreAnsweredAndLinesThatAreLostAreCounted)
 {
     std::array<int, 2> ends{};
@@ -546,15 +569,18 @@ TEST(BlockedLogTest, CallsAreAnsweredAndLinesThatAreLostAreCounted)
     const platform::FileDescriptor writer(ends[1]);
     Kestod kestod({}, {{"KESTO_LOG", "default"}});
     kestod.start({.standardError = writer.get()});
-    WireClient client(kestod.socketPath());
-    client.ask(Create, 1);
-    constexpr int calls = 12'000; // each with a line: more than may wait
-    for (int call = 0; call < calls; ++call)
-        client.call(Validate, 1);
-    for (int call = 0; call < calls; ++call)
-        ASSERT_TRUE(client.nextReply());
-    EXPECT_GT(readLedger(kestod)[Counter::LogLinesLost], 0U);
-    client.call(KillService);
+    constexpr int callsOfAClient = 1500; // each with a line, and within the client's share
+    for (int count = 0; count < 8; ++count) { // more than may wait
+        WireClient client(kestod.socketPath());
+        for (int call = 0; call < callsOfAClient; ++call)
+            client.call(Validate, 1);
+        for (int call = 0; call < callsOfAClient; ++call)
+            ASSERT_TRUE(client.nextReply());
+    }
+    const ledger::Account account = readLedger(kestod);
+    EXPECT_GT(account[Counter::LogLinesLost], 0U);
+    EXPECT_EQ(account[Counter::LogLinesLeftOut], 0U);
+    WireClient(kestod.socketPath()).call(KillService);
     EXPECT_EQ(kestod.exitStatus(), 2) << "the end does not wait for ever";
 }
 

@@ -113,9 +113,14 @@ void Kestod::start(const InheritedDescriptors& inherited)
         ::signal(SIGPIPE, SIG_DFL); // as in a shell; the test may have inherited another setting
         char name[] = "kestod";
         char* arguments[] = {name, nullptr};
-        ::execve(KESTOD_PATH, arguments, pointers.data());
+        ::execve(program(), arguments, pointers.data());
         ::_exit(127);
     }
+}
+
+const char* Kestod::program() noexcept
+{
+    return KESTOD_PATH;
 }
 
 void Kestod::kill()

@@ -52,6 +52,8 @@ public:
     // Files of the configuration directory by name, such as "device.toml".
     using Files = std::map<std::string, std::string>;
 
+    [[nodiscard]] static const char* program() noexcept;
+
     // Makes the directories and the files, and does not start the process. Adds further variables to the usual ones; an
     // empty one is not set.
     explicit Kestod(const Files& configuration = {}, Environment further = {});

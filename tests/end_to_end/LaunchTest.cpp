@@ -48,6 +48,31 @@ INSTANTIATE_TEST_SUITE_P(
         BadLaunch{"ALogLevelThatDoesNotExist", {{"KESTO_LOG", "loud"}}, "KESTO_LOG"}),
     [](const auto& input) { return input.param.name; });
 
+// What the program prints for these arguments, and its exit status.
+std::pair<std::string, int> answerTo(const std::string& arguments)
+{
+    FILE* const output = ::popen((std::string(Kestod::program()) + " " + arguments + " 2>&1").c_str(), "r");
+    std::string text;
+    for (int character = std::fgetc(output); character != EOF; character = std::fgetc(output))
+        text += static_cast<char>(character);
+    return {text, WEXITSTATUS(::pclose(output))};
+}
+
+TEST(LaunchTest, OnItsCommandLineItOnlySaysWhoItIs)
+{
+    EXPECT_EQ(answerTo("--version"), (std::pair<std::string, int>("kestod 0.1.0\n", 0)));
+    const auto [help, status] = answerTo("--help");
+    EXPECT_EQ(status, 0);
+    EXPECT_THAT(help, testing::StartsWith("Usage: kestod [--help | --version]\n"));
+    for (const char* variable : {"RUNTIME_DIRECTORY", "STATE_DIRECTORY", "LOGS_DIRECTORY", "CONFIGURATION_DIRECTORY",
+                                 "KESTO_SERVICE_NAME", "KESTO_LOG"})
+        EXPECT_THAT(help, HasSubstr(variable));
+    EXPECT_EQ(answerTo("--socket /run"),
+              (std::pair<std::string, int>("kestod: it takes no argument but --help and --version, not --socket; its "
+                                           "configuration is in its environment\n",
+                                           cannotRun)));
+}
+
 TEST(LaunchTest, WithTooFewDescriptorsForItselfItSaysSoAndDoesNotStart)
 {
     Kestod kestod;

@@ -2,6 +2,7 @@
 #include "platform/linux/memory/MemoryConfiguration.h"
 #include "platform/linux/settings/TomlFile.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
+#include "platform/linux/store/applications/ApplicationRules.h"
 
 #include <fstream>
 #include <gmock/gmock.h>
@@ -37,7 +38,16 @@ TEST(ExampleConfiguration, AnalyticsShowsEveryDefault)
     const auto checked = readAnalyticsConfiguration(values);
     EXPECT_THAT(checked.problems, IsEmpty());
     EXPECT_EQ(checked.configuration, AnalyticsConfiguration());
-    EXPECT_EQ(values.size(), 4U) << "a key that the example does not show";
+    EXPECT_EQ(values.size(), 6U) << "a key that the example does not show";
+}
+
+TEST(ExampleConfiguration, ApplicationsShowEveryDefault)
+{
+    const Dictionary values = parsed(textOf("applications.toml"));
+    const auto checked = readApplicationsConfiguration(values);
+    EXPECT_THAT(checked.problems, IsEmpty());
+    EXPECT_EQ(checked.configuration, ApplicationsConfiguration());
+    EXPECT_EQ(values.size(), 2U) << "a key that the example does not show";
 }
 
 TEST(ExampleConfiguration, LimitsShowEveryDefaultAndTheMostMemory)

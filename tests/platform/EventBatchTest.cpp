@@ -209,6 +209,70 @@ TEST(EventBatchTest, AStampThatIsANumberSaysWhenTheMessageHappened)
     EXPECT_EQ(batch.rows()[0].happened, std::nullopt);
 }
 
+// --- What a payload says about playing
+
+TEST(EventBatchTest, WhatAPayloadSaysAboutPlayingIsRead)
+{
+    EventBatch batch;
+    batch.add(1, "a",
+              {{"session_output_running", true},
+               {"session_input_running", 0},
+               {"session_duration", "long"},
+               {"active_devices", "speaker"},
+               {"session_selected_format", "S16LE/44100/2"},
+               {"mChannelsPerFrame", 2.0},
+               {"PomoSessionVolume", 0.5},
+               {"kestoreporting_timestamp", 7}});
+    batch.add(1, "a", {{"kestoreporting_timestamp", 8}, {"active_device", 1}, {"session_durations", 1}});
+    const auto rows = batch.rows();
+    EXPECT_EQ(rows[0].happened, 7.0);
+    ASSERT_NE(rows[0].playing, nullptr);
+    EXPECT_EQ(rows[0].playing->isOutputRunning, true);
+    EXPECT_EQ(rows[0].playing->isInputRunning, false);
+    EXPECT_TRUE(rows[0].playing->hasDuration);
+    EXPECT_EQ(rows[0].playing->devices, "speaker");
+    EXPECT_EQ(rows[0].playing->format, "S16LE/44100/2");
+    EXPECT_EQ(rows[0].playing->channels, 2);
+    EXPECT_EQ(rows[0].playing->volume, 0.5);
+    EXPECT_EQ(rows[1].happened, 8.0);
+    EXPECT_EQ(rows[1].playing, nullptr);
+}
+
+TEST(EventBatchTest, WhatPayloadsSayAboutPlayingStaysWithThemWhenBatchesAreJoined)
+{
+    EventBatch batch;
+    EventBatch second;
+    batch.add(1, "a", {{"active_devices", "speaker"}});
+    batch.add(1, "b", {{"n", 1}});
+    second.add(1, "c", {{"n", 2}});
+    second.add(1, "d", {{"active_devices", "headset"}, {"text", std::string(100'000, 'x')}});
+    batch.takeFrom(second);
+    const auto rows = batch.rows();
+    EXPECT_EQ(rows[0].playing->devices, "speaker");
+    EXPECT_EQ(rows[1].playing, nullptr);
+    EXPECT_EQ(rows[2].playing, nullptr);
+    EXPECT_EQ(rows[3].playing->devices, "headset");
+}
+
+TEST(EventBatchTest, EndsOfPlayingKeepTheirPlaceAmongTheMessages)
+{
+    EventBatch batch;
+    EventBatch second;
+    batch.add(1, "a", {{"n", 1}});
+    batch.add(1, "b", notJson);
+    second.announcePlayingEnd(3, 8, PlayingEnding::Stopped);
+    second.add(1, "c", {{"n", 2}});
+    second.announcePlayingEnd(4, 9, PlayingEnding::Vanished);
+    batch.takeFrom(second);
+    EXPECT_THAT(batch.announcements().playingEnds,
+                ElementsAre(PlayingEnd{.session = 3, .time = 8, .ending = PlayingEnding::Stopped, .place = 2},
+                            PlayingEnd{.session = 4, .time = 9, .ending = PlayingEnding::Vanished, .place = 3}));
+    ASSERT_EQ(batch.rows().size(), 2U);
+    EXPECT_EQ(batch.rows()[1].place, 2U) << "the lost one has a place too";
+    batch.clear();
+    EXPECT_TRUE(batch.empty());
+}
+
 // --- Origins
 
 TEST(EventBatchTest, SaysHowManyEventsAreOfWhichOrigin)

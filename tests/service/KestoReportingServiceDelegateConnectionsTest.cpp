@@ -146,6 +146,8 @@ TEST_F(ClientConnectionTest, ThatIsClosedLeavesTheRegistryAndTellsItsTime)
     EXPECT_THAT(platform.analytics.events(),
                 ElementsAre(AnalyticsEvent{std::string(uptimeEvent), {{"processName", "player"}, {"seconds", 12.5}}}));
     EXPECT_EQ(uptimes()[0].kind(), Number::Kind::Float64);
+    ASSERT_EQ(platform.analytics.origins().size(), 1U);
+    EXPECT_NE(platform.analytics.origins()[0].source, 0U);
 }
 
 TEST_F(ClientConnectionTest, ThatIsClosedHasItsClientLeaveBeforeAnythingElseIsDone)

@@ -64,10 +64,21 @@ void report(const Rounds& rounds)
                account[Counter::Salvaged]);
 }
 
+void reportLosses(const ledger::Account& account)
+{
+    for (const ledger::CounterRow& row : ledger::counterRows())
+        if (ledger::chargeOf(row.counter) == ledger::Charge::Lost && account[row.counter] != 0)
+            fmt::print("{}: {}\n", row.path, account[row.counter]);
+    for (const auto& [culprit, count] : account.culprits[static_cast<std::size_t>(ledger::Charge::Lost)])
+        fmt::print("lost by user {}, process \"{}\", application \"{}\": {}\n", culprit.user, culprit.process,
+                   culprit.application, count);
+}
+
 void reportBroken(const Rounds& rounds, const std::vector<std::string>& broken, const Options& options)
 {
     const std::string log = rounds.kestod().log();
     fmt::print("log of the service:\n{}\n", log.substr(log.size() - std::min(log.size(), mostOfLog)));
+    reportLosses(end_to_end::readLedger(rounds.kestod()));
     for (const std::string& each : broken)
         fmt::print("BROKEN: {}\n", each);
     fmt::print("after round {}: {}\nto see it again: --seed {} --clients {}\n", rounds.count(),

@@ -42,7 +42,8 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
       performanceWriter_(fileSystem_, ProviderLog(log_)),
       memory_(workQueues_, configurationWatcher_, ProviderLog(log_)),
       analytics_(std::make_unique<SqliteKeeper>(launch.stateDirectory, clock_, ProviderLog(log_)),
-                 configurationWatcher_, clock_, ledger_, ProviderLog(log_))
+                 configurationWatcher_, clock_, ledger_, ProviderLog(log_),
+                 loadApplicationRules(launch.configurationDirectory, launch.stateDirectory, ProviderLog(log_)))
 {
     log_.setLedger(ledger_);
     preferences_.setChangeHandler([this](std::string_view domain) { notifications_.post(notificationOf(domain)); });

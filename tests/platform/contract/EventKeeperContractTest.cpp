@@ -155,6 +155,26 @@ TEST_P(EventKeeperContract, ChargesALossToWhoSentTheEvent)
     EXPECT_EQ(tally.charged()[0].count, 1U);
 }
 
+TEST_P(EventKeeperContract, WhatASessionPlayedCostsNoEventWhateverEndsIt)
+{
+    batch.announce(platform::SourceBegin{.number = 7, .userIdentifier = 1000, .processName = "player"});
+    batch.announce(platform::SessionBegin{.number = 9, .source = 7, .reporterID = 42});
+    const double now = subject->clock.secondsSince1970();
+    batch.add(now, {.source = 7, .session = 9}, "com.quarn.kesto.Playback.Start", {{"session_output_running", true}});
+    keep();
+    subject->clock.advance(2);
+    batch.announcePlayingEnd(9, now + 2, platform::PlayingEnding::Stopped);
+    keep();
+    subject->keeper().beginEnd();
+    batch.announcePlayingEnd(9, now + 2, platform::PlayingEnding::Vanished);
+    batch.announceSessionEnd({.number = 9, .time = now + 2});
+    keep();
+    tidy();
+    EXPECT_THAT(subject->payloads(), ElementsAre("{\"session_output_running\":true}"));
+    EXPECT_EQ(tally[Counter::Kept], 1U);
+    EXPECT_EQ(subject->keeper().state()->events, 1U);
+}
+
 TEST_P(EventKeeperContract, RemovesWhatIsTooOld)
 {
     configuration.maximumAgeDays = 10;

@@ -117,11 +117,11 @@ void FakeAnalytics::sendAnalyticsEventLazy(platform::Turn& turn, const platform:
     send(turn.tally, origin, std::string(eventName), std::move(payloadBuilder));
 }
 
-void FakeAnalytics::sendAnalyticsEventLazy(platform::OutsideTurn, const platform::Origin& origin,
+void FakeAnalytics::sendAnalyticsEventLazy(platform::OutsideTurn, const platform::SourceBegin& source,
                                            std::string_view eventName, PayloadBuilder payloadBuilder)
 {
     ledger::Tally tally;
-    send(tally, origin, std::string(eventName), std::move(payloadBuilder));
+    send(tally, {.source = source.number, .session = 0}, std::string(eventName), std::move(payloadBuilder));
     ledger_.post(tally);
 }
 

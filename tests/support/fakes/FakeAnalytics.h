@@ -50,10 +50,11 @@ public:
     // Forgets everything except the wanted names, and releases payloads that are not built.
     void clear();
 
+    [[nodiscard]] bool isEnabled() const override { return true; }
     bool isAnalyticsEventUsed(std::string_view eventName) override;
     void sendAnalyticsEventLazy(platform::Turn& turn, const platform::Origin& origin, std::string_view eventName,
                                 PayloadBuilder payloadBuilder) override;
-    void sendAnalyticsEventLazy(platform::OutsideTurn, const platform::Origin& origin, std::string_view eventName,
+    void sendAnalyticsEventLazy(platform::OutsideTurn, const platform::SourceBegin& source, std::string_view eventName,
                                 PayloadBuilder payloadBuilder) override;
     void reportLosses() override { whenReporting_(); }
     // From now on a request to report losses calls this.

@@ -108,11 +108,10 @@ bool isTemporaryName(std::string_view name)
     return !randomDigitsBetween(temporaryBegin, temporaryEnd, name).empty();
 }
 
-std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes)
+std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes, ReadableBy readers)
 {
-    constexpr mode_t readableByGroup = 0640;
-    const FileDescriptor file(
-        ::openat(directory, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, readableByGroup));
+    const FileDescriptor file(::openat(directory, name.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC,
+                                       static_cast<mode_t>(readers)));
     if (!file)
         return systemError();
     if (const int error = writeAll(file.get(), bytes); error != 0)

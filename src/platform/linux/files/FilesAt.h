@@ -12,6 +12,7 @@
 #include <functional>
 #include <string>
 #include <string_view>
+#include <sys/types.h>
 #include <system_error>
 #include <vector>
 
@@ -39,8 +40,10 @@ namespace platform {
 // Whether it is such a name. A killed process leaves its unfinished files.
 [[nodiscard]] bool isTemporaryName(std::string_view name);
 
+enum class ReadableBy : mode_t { Group = 0640, Owner = 0600 };
 // Writes a new file, down to the disk.
-[[nodiscard]] std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes);
+[[nodiscard]] std::error_code writeFileAt(int directory, const std::string& name, std::string_view bytes,
+                                          ReadableBy readers = ReadableBy::Group);
 
 // Whether it is a regular file of this process's user.
 [[nodiscard]] bool isOwnFileAt(int directory, const std::string& name);

@@ -29,24 +29,21 @@ bool readPart(const Value& value, double& part)
     return true;
 }
 
-// Stores the value, or returns what should stand there instead.
-std::string_view read(std::string_view key, const Value& value, Settings& settings)
-{
-    constexpr std::string_view part = "a part above 0, up to 1";
-    if (key == "memory_mb") {
-        const auto megabytes = positiveNumberOf(value);
-        if (!megabytes || *megabytes < 1 || *megabytes > mostMegabytes)
-            return "a number of megabytes from 1 to 1048576";
-        settings.bytes = *megabytes * bytesOfAMegabyte;
-    } else if (key == "memory_part_of_user") {
-        return readPart(value, settings.partOfAUser) ? std::string_view() : part;
-    } else if (key == "memory_part_of_client") {
-        return readPart(value, settings.partOfAClient) ? std::string_view() : part;
-    } else {
-        return "nothing: the keys are memory_mb, memory_part_of_user and memory_part_of_client";
-    }
-    return {};
-}
+constexpr std::string_view part = "a part above 0, up to 1";
+
+constexpr Setting<Settings> table[] = {
+    {"memory_mb", "a number of megabytes from 1 to 1048576",
+     [](const Value& value, Settings& settings) {
+         const auto megabytes = positiveNumberOf(value);
+         if (!megabytes || *megabytes < 1 || *megabytes > mostMegabytes)
+             return false;
+         settings.bytes = *megabytes * bytesOfAMegabyte;
+         return true;
+     }},
+    {"memory_part_of_user", part,
+     [](const Value& value, Settings& settings) { return readPart(value, settings.partOfAUser); }},
+    {"memory_part_of_client", part,
+     [](const Value& value, Settings& settings) { return readPart(value, settings.partOfAClient); }}};
 
 } // namespace
 
@@ -55,8 +52,7 @@ CheckedMemoryLimits readMemoryLimits(const foundation::Dictionary& values, std::
     Settings settings{.bytes = static_cast<double>(std::clamp(bytesOfTheMachine / DefaultMemory::partOfTheMachine,
                                                               DefaultMemory::least, DefaultMemory::most))};
     CheckedMemoryLimits checked;
-    checked.problems =
-        checkSettings(values, [&](std::string_view key, const Value& value) { return read(key, value, settings); });
+    checked.problems = readSettings<Settings>(values, table, settings);
     const double ofAUser = settings.bytes * settings.partOfAUser;
     checked.limits = {.ofTheService = static_cast<std::size_t>(settings.bytes),
                       .ofAUser = static_cast<std::size_t>(ofAUser),

@@ -101,18 +101,23 @@ bool TomlFile::reload()
         return false;
     seen_ = std::move(content);
     if (!seen_) {
-        log_.error("{} cannot be read: {}; its earlier content stays in force", path_.native(),
-                   seen_.error().message());
+        log_.error("{} cannot be read: {}; {} until this is corrected", path_.native(), seen_.error().message(),
+                   whatApplies());
         return false;
     }
     auto parsed = parseToml(*seen_);
     if (!parsed) {
         const TomlError& error = parsed.error();
-        log_.error("{}:{}:{}: {}; the file's earlier content stays in force until this is corrected", path_.native(),
-                   error.line, error.column, error.reason);
+        log_.error("{}:{}:{}: {}; {} until this is corrected", path_.native(), error.line, error.column, error.reason,
+                   whatApplies());
         return false;
     }
     return setValues(std::move(*parsed));
+}
+
+std::string_view TomlFile::whatApplies() const noexcept
+{
+    return values_.empty() ? "the defaults apply" : "the file's earlier content stays in force";
 }
 
 bool TomlFile::setValues(Dictionary values)

@@ -1,7 +1,7 @@
 // One TOML file of the configuration, and the last good values that it held.
 //
-// A person who edits a file may break it for a while. Its earlier content then stays in force, and one log line names
-// the place of the error.
+// A person who edits a file may break it for a while. Its earlier content then stays in force, or the defaults if it
+// had none, and one log line names the place of the error.
 #pragma once
 
 #include "foundation/values/Value.h"
@@ -44,6 +44,7 @@ public:
 private:
     using Content = std::expected<std::string, std::error_code>;
 
+    [[nodiscard]] std::string_view whatApplies() const noexcept;
     [[nodiscard]] bool setValues(foundation::Dictionary values);
 
     std::filesystem::path path_;

@@ -17,10 +17,12 @@ enum class StoreSynchronization : std::uint8_t {
 };
 
 struct AnalyticsConfiguration {
+    bool enabled = true; // false: no event is stored
     std::vector<std::string> used = {"com.quarn.*"}; // globs
     double maximumAgeDays = 90;
     std::uint64_t maximumSizeMegabytes = 256; // of 1024 * 1024 bytes
     StoreSynchronization synchronization = StoreSynchronization::Normal;
+    bool stretches = true; // whether the store keeps who played what for how long
 
     friend bool operator==(const AnalyticsConfiguration&, const AnalyticsConfiguration&) = default;
 };

@@ -33,12 +33,26 @@ bool AnalyticsStore::isRoomBeside(const EventBatch& events, std::size_t waiters)
 
 // --- For callers
 
+namespace {
+
+EventBatch::PayloadFilter filterBy(const ApplicationRules* rules)
+{
+    if (rules == nullptr)
+        return {};
+    return [rules](const foundation::Dictionary& payload) { return rules->shown(payload); };
+}
+
+} // namespace
+
 AnalyticsStore::AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
-                               ledger::Ledger& ledger, ProviderLog log, Limits limits)
+                               ledger::Ledger& ledger, ProviderLog log, Limits limits,
+                               std::unique_ptr<const ApplicationRules> rules)
     : clock_(clock),
       ledger_(ledger),
       log_(log),
       limits_(limits),
+      rules_(std::move(rules)),
+      filter_(filterBy(rules_.get())),
       storedByLedger_(ledger.account().stored()),
       keeper_(std::move(keeper)),
       configurationFile_(watcher, "analytics.toml", log, [this] { applyConfiguration(); })
@@ -69,7 +83,8 @@ void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, const Origin& origin, st
     if (!isAnalyticsEventUsed(eventName)) // most callers have asked already, and then this costs little
         return turn.tally.add(Counter::Unwanted);
     const double time = clock_.secondsSince1970();
-    turn.events.add(time, origin, eventName, payloadBuilder());
+    if (!turn.events.add(time, origin, eventName, payloadBuilder(), filter_))
+        return turn.tally.add(Counter::Unwanted);
     if (isRoomBeside(turn.events, 0))
         return;
     const foundation::Lock lock(lock_);
@@ -79,7 +94,7 @@ void AnalyticsStore::sendAnalyticsEventLazy(Turn& turn, const Origin& origin, st
     waitForRoom();
 }
 
-void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, const Origin& origin, std::string_view eventName,
+void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, const SourceBegin& source, std::string_view eventName,
                                             PayloadBuilder payloadBuilder)
 {
     ledger::Tally tally;
@@ -91,7 +106,10 @@ void AnalyticsStore::sendAnalyticsEventLazy(OutsideTurn, const Origin& origin, s
     const double time = clock_.secondsSince1970();
     const foundation::Dictionary payload = payloadBuilder();
     const foundation::Lock lock(lock_);
-    waiting_.events.add(time, origin, eventName, payload);
+    if (source.number != 0)
+        waiting_.events.announce(source);
+    if (!waiting_.events.add(time, {.source = source.number, .session = 0}, eventName, payload, filter_))
+        tally.add(Counter::Unwanted);
     waiting_.tally.takeFrom(tally);
     wakeKeeper();
     waitForRoom();
@@ -179,7 +197,8 @@ void AnalyticsStore::applyConfiguration()
     {
         const foundation::Lock lock(lock_);
         auto checked = readAnalyticsConfiguration(configurationFile_.values());
-        names_.setPatterns(checked.configuration.used);
+        names_.setPatterns(checked.configuration.enabled ? checked.configuration.used : std::vector<std::string>());
+        isEnabled_ = checked.configuration.enabled;
         newConfiguration_ = std::move(checked.configuration);
         problems = std::move(checked.problems);
         wakeKeeper();
@@ -278,6 +297,8 @@ bool AnalyticsStore::take(Batch& batch)
         isKeeperAwake_ = false;
         std::swap(configuration, newConfiguration_);
         std::swap(batch, waiting_);
+        if (rules_)
+            rules_->hideNames(batch.events.announcements());
         isWriting_ = !batch.empty();
         inWriting_ = &batch.events;
         origins_.committed();

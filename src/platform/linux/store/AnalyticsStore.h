@@ -17,8 +17,10 @@
 #include "platform/linux/settings/WatchedTomlFile.h"
 #include "platform/linux/store/EventKeeper.h"
 #include "platform/linux/store/UsedEventNames.h"
+#include "platform/linux/store/applications/ApplicationRules.h"
 #include "platform/linux/store/tables/KnownOrigins.h"
 
+#include <atomic>
 #include <chrono>
 #include <cstddef>
 #include <functional>
@@ -49,22 +51,24 @@ public:
     // Hands events to the keeper. analytics.toml in the configuration directory says which events the store keeps, and
     // for how long.
     AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
-                   ledger::Ledger& ledger, ProviderLog log, Limits limits);
+                   ledger::Ledger& ledger, ProviderLog log, Limits limits,
+                   std::unique_ptr<const ApplicationRules> rules = nullptr);
     AnalyticsStore(std::unique_ptr<EventKeeper> keeper, ConfigurationWatcher& watcher, const Clock& clock,
-                   ledger::Ledger& ledger, ProviderLog log)
-        : AnalyticsStore(std::move(keeper), watcher, clock, ledger, log, Limits())
+                   ledger::Ledger& ledger, ProviderLog log, std::unique_ptr<const ApplicationRules> rules = nullptr)
+        : AnalyticsStore(std::move(keeper), watcher, clock, ledger, log, Limits(), std::move(rules))
     {
     }
     // Writes everything that was sent, except for turns that have not ended.
     ~AnalyticsStore() override;
 
+    [[nodiscard]] bool isEnabled() const override { return isEnabled_.load(std::memory_order_relaxed); }
     [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override { return names_.contains(eventName); }
     // Both stamp the event with the time and build its payload before they return. They block only while too much waits
     // to be written. An event of a turn is written when the turn has ended or is too large, any other event as soon as
     // possible.
     void sendAnalyticsEventLazy(Turn& turn, const Origin& origin, std::string_view eventName,
                                 PayloadBuilder payloadBuilder) override;
-    void sendAnalyticsEventLazy(OutsideTurn, const Origin& origin, std::string_view eventName,
+    void sendAnalyticsEventLazy(OutsideTurn, const SourceBegin& source, std::string_view eventName,
                                 PayloadBuilder payloadBuilder) override;
 
     // Takes the events and the counts of a turn. Calls `whenKept`, unless it is empty, once everything taken so far is
@@ -76,6 +80,8 @@ public:
     // Whether more than half of what may wait for the store's thread does, so that the end of a turn may block soon.
     [[nodiscard]] bool isFillingUp();
 
+    // The service begins to end: what connections leave behind from now on ends with it.
+    void beginEnd() { keeper_->beginEnd(); }
     // Returns when everything taken so far is committed or counted as lost.
     void flush();
     // The same, and leaves the keeper's place as a service does that ends in order: the process ends soon without
@@ -118,7 +124,10 @@ private:
     ledger::Ledger& ledger_;
     const ProviderLog log_;
     const Limits limits_;
+    const std::unique_ptr<const ApplicationRules> rules_; // null: none apply
+    const EventBatch::PayloadFilter filter_; // by the rules; empty: none apply
     UsedEventNames names_;
+    std::atomic<bool> isEnabled_ = true;
     // Only for the store's thread.
     std::optional<ledger::StoreState> lastState_;
     std::uint64_t storedByLedger_; // the events that are in the store according to the ledger

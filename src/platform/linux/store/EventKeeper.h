@@ -41,6 +41,8 @@ public:
     // Does a part of the tidying that is due: removes events that are too old or too many. True if more is left to do.
     // `isQuiet`: no events wait now.
     virtual bool tidy(bool isQuiet, ledger::Tally& tally) = 0;
+    // The service begins to end: the connections that end from now on end with it. Any thread.
+    virtual void beginEnd() = 0;
     // Leaves the place as a service does that ends in order, because the process ends soon without closing it.
     virtual void prepareForEnd() = 0;
     // What the place holds now; nothing while it is not open, or while it gets back what damage took away.

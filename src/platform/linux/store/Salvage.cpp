@@ -216,10 +216,9 @@ void Salvage::lookAtPages()
     lastNumber_ = sequence_;
     std::uint32_t most = pagesAtOnce;
     for (std::size_t table = 0; table < tables_.size(); ++table) {
-        if (!SalvagedTables::holdsEvents(tables_[table].name))
-            continue;
-        lastNumber_ = std::max(lastNumber_, tables_[table].lastNumber);
-        if (tables_[table].pages > most) {
+        if (SalvagedTables::isNumberedAsEvents(tables_[table].name))
+            lastNumber_ = std::max(lastNumber_, tables_[table].lastNumber);
+        if (SalvagedTables::holdsEvents(tables_[table].name) && tables_[table].pages > most) {
             most = tables_[table].pages;
             large_ = static_cast<std::uint8_t>(table);
         }

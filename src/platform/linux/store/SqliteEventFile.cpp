@@ -23,10 +23,12 @@ template <typename Work> SqliteEventFile::Expected<> SqliteEventFile::inTransact
 
 // --- Opening
 
-SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>>
-SqliteEventFile::open(const std::filesystem::path& path, const Clock& clock, KnownOrigins& origins)
+SqliteEventFile::Expected<std::unique_ptr<SqliteEventFile>> SqliteEventFile::open(const std::filesystem::path& path,
+                                                                                  const Clock& clock,
+                                                                                  KnownOrigins& origins,
+                                                                                  Stretches& stretches)
 {
-    std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path, clock, origins));
+    std::unique_ptr<SqliteEventFile> database(new SqliteEventFile(path, clock, origins, stretches));
     for (const auto step : {&SqliteEventFile::lockDirectory, &SqliteEventFile::connect, &SqliteEventFile::makeSchema,
                             &SqliteEventFile::configure, &SqliteEventFile::prepareStatements,
                             &SqliteEventFile::compareCounts, &SqliteEventFile::beginRun})
@@ -87,6 +89,10 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
     if (!originRows)
         return corruptIfOther(originRows.error());
     originRows_ = std::move(*originRows);
+    auto stretchRows = StretchRows::open(*connection_);
+    if (!stretchRows)
+        return corruptIfOther(stretchRows.error());
+    stretchRows_ = std::move(*stretchRows);
     auto holders = EventHolders::open(*connection_);
     if (!holders)
         return corruptIfOther(holders.error());
@@ -124,7 +130,8 @@ SqliteEventFile::Expected<> SqliteEventFile::prepareStatements()
 // The ledger believes the counts, so they must not wait for the first event to contradict them.
 SqliteEventFile::Expected<> SqliteEventFile::compareCounts()
 {
-    const auto last = connection_->number("SELECT coalesce(max(id), 0) FROM messages");
+    const auto last = connection_->number("SELECT max((SELECT coalesce(max(id), 0) FROM messages),"
+                                          " (SELECT coalesce(max(id), 0) FROM stretches))");
     if (!last)
         return std::unexpected(last.error());
     if (*last >= counts_.counts().nextEvent)
@@ -136,19 +143,44 @@ SqliteEventFile::Expected<> SqliteEventFile::compareCounts()
 SqliteEventFile::Expected<> SqliteEventFile::beginRun()
 {
     StoreCounts& counts = counts_.counts();
+    // A database without a past has the time of this moment there.
+    const auto endOfEarlierRun = counts.nextEvent > 1 ? std::optional(counts.clock.wall) : std::nullopt;
     ageClock_.emplace(clock_, counts.clock, counts.nextEvent);
     committedAgeClock_ = ageClock_;
     const bool isKnown = origins_.epoch == counts_.epoch();
     if (!isKnown) {
-        origins_.epoch = counts_.epoch();
         origins_.sources.forgetRows();
         origins_.sessions.forgetRows();
+        stretches_.forgetRows();
     }
-    return inTransaction([&]() -> Expected<> {
-        if (const auto done = ages_.markNow(counts.nextEvent, counts.clock.time); !done)
-            return done;
-        return isKnown ? Expected<>() : originRows_.closeEarlierRun(counts);
+    const auto done = inTransaction([&]() -> Expected<> {
+        if (const auto marked = ages_.markNow(counts.nextEvent, counts.clock.time); !marked)
+            return marked;
+        return isKnown ? Expected<>() : closeEarlierRun(endOfEarlierRun);
     });
+    if (done)
+        origins_.epoch = counts_.epoch(); // else the next opening closes the earlier run
+    return done;
+}
+
+// What runs in this run is in memory: rows of it come only from a database that was damaged.
+SqliteEventFile::Expected<> SqliteEventFile::closeEarlierRun(std::optional<double> end)
+{
+    if (!stretches_.wereWritten() && end) {
+        stretches_.setEarlierEnd(*end);
+        const auto unfinished = stretchRows_.unfinished();
+        if (!unfinished)
+            return std::unexpected(unfinished.error());
+        for (auto [owner, stretch, arrived] : *unfinished) {
+            stretch.seconds = lengthOfTime(arrived, *end);
+            ++(stretch.seconds > 0 ? stretchCounts_.closed : stretchCounts_.leftOut);
+            if (const auto done = stretch.seconds > 0 ? insertStretch(owner, stretch) : Expected<>(); !done)
+                return done;
+        }
+    }
+    if (const auto done = stretchRows_.forgetUnfinished(); !done)
+        return done;
+    return originRows_.closeEarlierRun(counts_.counts());
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::setSynchronization(StoreSynchronization synchronization)
@@ -214,6 +246,43 @@ SqliteEventFile::Expected<> SqliteEventFile::insert(std::int64_t id, const Event
     insert_.bind(7, resolved.holder);
     insert_.bind(8, row.payload); // every payload is far shorter than SQLite's limit
     return insert_.run();
+}
+
+SqliteEventFile::Expected<> SqliteEventFile::insertStretches()
+{
+    if (!stretches_.hasChanges())
+        return {};
+    for (const Stretch& stretch : stretches_.ended()) {
+        const auto owner = ownerOf(stretch.origin);
+        if (!owner)
+            return std::unexpected(owner.error());
+        if (const auto done = insertStretch(*owner, stretch); !done)
+            return done;
+    }
+    for (const Stretches::Change& change : stretches_.rowChanges()) {
+        const auto owner = change.open == nullptr ? StretchRows::Owner() : ownerOf(change.open->origin);
+        if (!owner)
+            return std::unexpected(owner.error());
+        const auto done =
+            change.open == nullptr ? stretchRows_.removeOpen(change.key) : stretchRows_.insertOpen(*owner, change);
+        if (!done)
+            return done;
+    }
+    return {};
+}
+
+SqliteEventFile::Expected<StretchRows::Owner> SqliteEventFile::ownerOf(const Origin& origin)
+{
+    const auto resolved = resolve(origin);
+    if (!resolved)
+        return std::unexpected(resolved.error());
+    return StretchRows::Owner{.holder = resolved->holder, .session = resolved->rows.session};
+}
+
+SqliteEventFile::Expected<> SqliteEventFile::insertStretch(const StretchRows::Owner& owner, const Stretch& stretch)
+{
+    holders_.add(owner.holder, StretchRows::bytesOf(stretch.state));
+    return stretchRows_.insert(counts_.counts().nextEvent++, owner, stretch);
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::commit()
@@ -345,13 +414,18 @@ SqliteEventFile::Expected<SqliteEventFile::EventsByHolder> SqliteEventFile::dele
             return std::unexpected(message.error());
         doomed.push_back(*message);
     }
-    if (doomed.empty()) {
+    const bool areAll = doomed.size() < most;
+    const auto haveStretches = doomed.empty() ? stretchRows_.areBelow(*below) : Expected<bool>(true);
+    if (!haveStretches)
+        return std::unexpected(haveStretches.error());
+    if (!*haveStretches) {
         if (const auto done = ages_.forget(*below); *below != 0 && !done)
             return std::unexpected(done.error());
         return EventsByHolder();
     }
     EventsByHolder events = eventsByHolder(doomed); // a holder may go with its last message
-    if (const auto done = remove(doomed); !done)
+    const StretchRows::Range stretches{.from = 0, .below = areAll ? *below : doomed.back().id, .holder = {}};
+    if (const auto done = remove(doomed, stretches); !done)
         return std::unexpected(done.error());
     return events;
 }
@@ -366,14 +440,17 @@ SqliteEventFile::Expected<SqliteEventFile::Removal> SqliteEventFile::deleteOfLar
     std::uint64_t counted = 0;
     std::uint64_t lookedAt = 0;
     std::int64_t next = largest->oldest;
+    bool areAll = false;
     selectFrom_.bind(1, largest->oldest);
     selectFrom_.bind(2, mostLookedAt);
     while (doomed.size() < most && counted < bytes) {
         const auto row = selectFrom_.step();
         if (!row)
             return std::unexpected(row.error());
-        if (!*row)
+        if (!*row) {
+            areAll = lookedAt < mostLookedAt;
             break;
+        }
         ++lookedAt;
         next = selectFrom_.integer(0) + 1;
         if (selectFrom_.integer(1) != largest->id)
@@ -386,9 +463,11 @@ SqliteEventFile::Expected<SqliteEventFile::Removal> SqliteEventFile::deleteOfLar
     }
     selectFrom_.reset();
     holders_.setOldest(largest->id, next);
-    if (doomed.empty() && lookedAt < mostLookedAt)
+    if (doomed.empty() && areAll)
         holders_.setEmpty(largest->id);
-    if (const auto done = remove(doomed); !done)
+    const StretchRows::Range stretches{
+        .from = largest->oldest, .below = areAll ? counts_.counts().nextEvent : next, .holder = largest->id};
+    if (const auto done = remove(doomed, stretches); !done)
         return std::unexpected(done.error());
     return Removal{
         .events = eventsOf(doomed), .holder = largest->holder, .isOnlyHolder = largest->isOnlyOne, .isDone = false};
@@ -426,9 +505,17 @@ SqliteEventFile::EventsByHolder SqliteEventFile::eventsByHolder(const std::vecto
     return events;
 }
 
-SqliteEventFile::Expected<> SqliteEventFile::remove(const std::vector<Doomed>& doomed)
+SqliteEventFile::Expected<> SqliteEventFile::remove(const std::vector<Doomed>& doomed,
+                                                    const StretchRows::Range& stretches)
 {
-    return inTransaction([&]() -> Expected<> {
+    std::uint64_t removedStretches = 0;
+    const auto all = inTransaction([&]() -> Expected<> {
+        const auto removed = stretchRows_.remove(stretches);
+        if (!removed)
+            return std::unexpected(removed.error());
+        for (const auto& [holder, bytes] : *removed)
+            holders_.remove(holder, bytes);
+        removedStretches = removed->size();
         for (const auto& [id, events, bytes, holder] : doomed) {
             delete_.bind(1, id);
             if (const auto done = delete_.run(); !done)
@@ -438,6 +525,9 @@ SqliteEventFile::Expected<> SqliteEventFile::remove(const std::vector<Doomed>& d
         counts_.counts().removed += static_cast<std::int64_t>(eventsOf(doomed));
         return originRows_.removeUnused();
     });
+    if (all)
+        stretchCounts_.removed += removedStretches;
+    return all;
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::shrink(std::uint64_t mostBytes)

@@ -16,6 +16,7 @@
 #include "platform/linux/store/tables/FirstEdition.h"
 #include "platform/linux/store/tables/OriginRows.h"
 #include "platform/linux/store/tables/StoreSchema.h"
+#include "platform/linux/store/tables/StretchRows.h"
 
 #include <chrono>
 #include <cstdint>
@@ -34,10 +35,10 @@ class SqliteEventFile {
 public:
     template <typename Result = void> using Expected = StoreExpected<Result>;
 
-    // Opens the file, or makes it. A file that is corrupt or of a later edition stays as it is. The origins, which must
-    // outlive the file, are those of this run.
-    [[nodiscard]] static Expected<std::unique_ptr<SqliteEventFile>> open(const std::filesystem::path& path,
-                                                                         const Clock& clock, KnownOrigins& origins);
+    // Opens the file, or makes it. A file that is corrupt or of a later edition stays as it is. The origins and the
+    // stretches, which must outlive the file, are those of this run.
+    [[nodiscard]] static Expected<std::unique_ptr<SqliteEventFile>>
+    open(const std::filesystem::path& path, const Clock& clock, KnownOrigins& origins, Stretches& stretches);
     SqliteEventFile(const SqliteEventFile&) = delete;
     SqliteEventFile& operator=(const SqliteEventFile&) = delete;
     ~SqliteEventFile();
@@ -50,6 +51,8 @@ public:
     // Inserts between `begin` and `commit` are kept together or not at all; `rollBack` drops them.
     [[nodiscard]] Expected<> begin();
     [[nodiscard]] Expected<> insert(std::span<const EventRow> rows);
+    // Writes what waits of the stretches, behind the events that ended them.
+    [[nodiscard]] Expected<> insertStretches();
     [[nodiscard]] Expected<> commit();
     void rollBack();
 
@@ -70,14 +73,21 @@ public:
     [[nodiscard]] std::uint64_t events() const noexcept { return counts_.committed().events(); }
     // The time of the first event; 0 without events.
     [[nodiscard]] Expected<double> oldest();
+    // How many stretches were closed that an earlier run left open, and how many were removed, since the last call.
+    struct StretchCounts {
+        std::uint64_t closed = 0;
+        std::uint64_t removed = 0;
+        std::uint64_t leftOut = 0; // of an earlier run too, but without a length
+    };
+    [[nodiscard]] StretchCounts takeStretchCounts() noexcept { return std::exchange(stretchCounts_, {}); }
     struct Size {
         std::uint64_t usedBytes = 0;
         std::uint64_t freeBytes = 0; // room in the file that no event uses
     };
     [[nodiscard]] Expected<Size> size();
     using EventsByHolder = std::map<EventHolder, std::uint64_t>;
-    // Deletes messages that were kept so many seconds ago or earlier, at most `most`. Returns how many events they
-    // were, and whose.
+    // Deletes messages that were kept so many seconds ago or earlier, at most `most`, and the stretches among them.
+    // Returns how many events they were, and whose.
     [[nodiscard]] Expected<EventsByHolder> deleteOlderThan(double seconds, std::uint64_t most);
     struct Removal {
         std::uint64_t events = 0;
@@ -86,7 +96,8 @@ public:
         bool isDone = false; // no more can be removed
     };
     // Deletes the oldest messages of the largest holder until they have freed so many bytes, but at most `most` of
-    // them. It looks at so many messages that new events hardly wait, so it may find none and still not be done.
+    // them, and its stretches among them. It looks at so many messages that new events hardly wait, so it may find none
+    // and still not be done.
     [[nodiscard]] Expected<Removal> deleteOfLargestHolder(std::uint64_t bytes, std::uint64_t most);
     // Returns free room of the file to the file system, at most so many bytes.
     [[nodiscard]] Expected<> shrink(std::uint64_t mostBytes);
@@ -98,10 +109,11 @@ private:
         std::int64_t holder = 0;
     };
 
-    SqliteEventFile(std::filesystem::path path, const Clock& clock, KnownOrigins& origins)
+    SqliteEventFile(std::filesystem::path path, const Clock& clock, KnownOrigins& origins, Stretches& stretches)
         : path_(std::move(path)),
           clock_(clock),
-          origins_(origins)
+          origins_(origins),
+          stretches_(stretches)
     {
     }
     [[nodiscard]] Expected<> lockDirectory();
@@ -111,6 +123,9 @@ private:
     [[nodiscard]] Expected<> prepareStatements();
     [[nodiscard]] Expected<> compareCounts();
     [[nodiscard]] Expected<> beginRun();
+    [[nodiscard]] Expected<> closeEarlierRun(std::optional<double> end);
+    [[nodiscard]] Expected<> insertStretch(const StretchRows::Owner& owner, const Stretch& stretch);
+    [[nodiscard]] Expected<StretchRows::Owner> ownerOf(const Origin& origin);
     [[nodiscard]] Expected<> keepTime();
     [[nodiscard]] Expected<> markFirstEdition(std::int64_t id, double time);
     [[nodiscard]] Expected<> insert(std::int64_t id, const EventRow& row, const Resolved& resolved);
@@ -126,17 +141,20 @@ private:
     [[nodiscard]] Expected<Doomed> look(std::int64_t id);
     [[nodiscard]] static std::uint64_t eventsOf(const std::vector<Doomed>& doomed);
     [[nodiscard]] EventsByHolder eventsByHolder(const std::vector<Doomed>& doomed) const;
-    [[nodiscard]] Expected<> remove(const std::vector<Doomed>& doomed);
+    [[nodiscard]] Expected<> remove(const std::vector<Doomed>& doomed, const StretchRows::Range& stretches);
 
     const std::filesystem::path path_;
     const Clock& clock_;
     KnownOrigins& origins_;
+    Stretches& stretches_;
     FileDescriptor directoryLock_;
     std::unique_ptr<SqliteConnection> connection_; // outlives the statements below
     std::uint64_t pageSize_ = 0;
     StoreCountsRow counts_;
     EventKinds kinds_;
     OriginRows originRows_;
+    StretchRows stretchRows_;
+    StretchCounts stretchCounts_;
     EventHolders holders_;
     std::optional<Resolved> lastResolved_; // of the running transaction
     EventAges ages_;

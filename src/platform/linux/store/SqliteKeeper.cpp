@@ -63,6 +63,8 @@ void SqliteKeeper::setConfiguration(const AnalyticsConfiguration& configuration)
 {
     configuration_ = configuration;
     hasMoreToTidy_ = true; // the new limits may be lower
+    if (!configuration_.stretches)
+        stretches_.endAll(clock_.secondsSince1970());
     if (database_)
         if (const auto done = database_->setSynchronization(configuration_.synchronization); !done)
             handleFailure(done.error());
@@ -132,7 +134,7 @@ SqliteKeeper::Expected<> SqliteKeeper::connect()
 {
     close();
     files_.emplace(path_);
-    auto opened = SqliteEventFile::open(path_, clock_, origins_);
+    auto opened = SqliteEventFile::open(path_, clock_, origins_, stretches_);
     if (!opened)
         return std::unexpected(opened.error());
     database_ = *std::move(opened);
@@ -168,17 +170,50 @@ void SqliteKeeper::keep(EventBatch& events, ledger::Tally& tally)
     const auto rows = events.rows();
     lose(StoreError::NotJson, events.rowsWithoutJson(), tally);
     const OriginAnnouncements& announced = events.announcements();
-    if (rows.empty() && !endsRows(announced))
+    followStretches(rows, announced);
+    if (rows.empty() && !endsRows(announced) && !stretches_.hasChanges()) {
+        countStretches(tally);
         return losses_.report();
+    }
     auto done = write(rows, announced);
     if (done ? !areFilesInPlace() : done.error() == StoreError::Corrupt)
         done = write(rows, announced); // now into another database
     origins_.end(announced); // also where nothing could be written
-    if (done)
+    if (done) {
         tally.add(ledger::Counter::Kept, countOf(rows));
-    else
+        if (!stretches_.ended().empty())
+            tally.add(ledger::Counter::StretchesKept, stretches_.ended().size());
+        stretches_.written();
+    } else {
         lose(done.error(), rows, tally);
+        stretches_.notWritten();
+    }
+    countStretches(tally);
     losses_.report();
+}
+
+void SqliteKeeper::followStretches(std::span<const EventRow> rows, const OriginAnnouncements& announced)
+{
+    if (!configuration_.stretches)
+        return;
+    const auto isAlive = [this](std::uint64_t session) {
+        const auto* const known = origins_.sessions.find(session);
+        return known != nullptr && !known->ended;
+    };
+    stretches_.take(rows, announced, isAlive, isServiceEnding_ ? StretchEnding::ServiceEnded : StretchEnding::Vanished);
+}
+
+void SqliteKeeper::countStretches(ledger::Tally& tally)
+{
+    const auto add = [&tally](ledger::Counter counter, std::uint64_t count) {
+        if (count != 0)
+            tally.add(counter, count);
+    };
+    const auto [closed, removed, leftOut] =
+        database_ ? database_->takeStretchCounts() : SqliteEventFile::StretchCounts();
+    add(ledger::Counter::StretchesKept, closed);
+    add(ledger::Counter::StretchesRemoved, removed);
+    add(ledger::Counter::StretchesLeftOut, leftOut + stretches_.takeLeftOut());
 }
 
 void SqliteKeeper::lose(StoreError reason, std::span<const EventRow> rows, ledger::Tally& tally)
@@ -216,6 +251,8 @@ SqliteKeeper::Expected<> SqliteKeeper::write(std::span<const EventRow> rows, con
         if (const auto done = database_->begin(); !done)
             return done;
         if (const auto done = database_->insert(rows); !done)
+            return done;
+        if (const auto done = database_->insertStretches(); !done)
             return done;
         origins_.end(announced); // behind its events
         return database_->commit();
@@ -289,6 +326,7 @@ bool SqliteKeeper::awaitsQuiet() const
 bool SqliteKeeper::tidy(bool isQuiet, ledger::Tally& tally)
 {
     const bool hasMore = tidySome(isQuiet, tally);
+    countStretches(tally);
     return std::exchange(hasBegunAnew_, false) || hasMore;
 }
 

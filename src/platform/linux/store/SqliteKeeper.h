@@ -13,6 +13,7 @@
 #include "platform/linux/store/Repair.h"
 #include "platform/linux/store/SqliteEventFile.h"
 
+#include <atomic>
 #include <cstdint>
 #include <filesystem>
 #include <functional>
@@ -53,6 +54,7 @@ public:
     void keep(EventBatch& events, ledger::Tally& tally) override; // in one transaction
     [[nodiscard]] bool awaitsQuiet() const override;
     bool tidy(bool isQuiet, ledger::Tally& tally) override;
+    void beginEnd() override { isServiceEnding_ = true; }
     void prepareForEnd() override;
     [[nodiscard]] std::optional<ledger::StoreState> state() const override;
     void reportLosses() override { losses_.reportAll(); }
@@ -73,6 +75,8 @@ private:
     [[nodiscard]] Expected<> write(std::span<const EventRow> rows, const OriginAnnouncements& announced);
     [[nodiscard]] bool endsRows(const OriginAnnouncements& announced);
     void handleFailure(StoreError error);
+    void followStretches(std::span<const EventRow> rows, const OriginAnnouncements& announced);
+    void countStretches(ledger::Tally& tally);
     void lose(StoreError reason, std::span<const EventRow> rows, ledger::Tally& tally);
     [[nodiscard]] bool isLogLongerBy(std::uint64_t bytes) const;
     [[nodiscard]] bool isLogFull();
@@ -90,6 +94,8 @@ private:
     EventLosses losses_;
     RemovalReport removals_;
     KnownOrigins origins_;
+    Stretches stretches_;
+    std::atomic<bool> isServiceEnding_ = false;
 
     std::function<void()> wake_;
 

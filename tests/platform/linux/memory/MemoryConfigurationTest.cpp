@@ -63,11 +63,14 @@ TEST(MemoryConfiguration, WhatIsWrongHasItsDefaultAndALine)
                                          "memory_part_of_user = 1.01\n");
     EXPECT_EQ(limits, read("").limits);
     EXPECT_THAT(problems,
-                ElementsAre("memory = 3 should be nothing: the keys are memory_mb, memory_part_of_user and "
+                ElementsAre("unknown key memory, ignored; the keys are memory_mb, memory_part_of_user, "
                             "memory_part_of_client",
-                            "memory_mb = 0.5 should be a number of megabytes from 1 to 1048576",
-                            "memory_part_of_client = 0 should be a part above 0, up to 1",
-                            "memory_part_of_user = 1.01 should be a part above 0, up to 1"));
+                            "memory_mb = 0.5 should be a number of megabytes from 1 to 1048576; the default counts "
+                            "until this is corrected",
+                            "memory_part_of_client = 0 should be a part above 0, up to 1; the default counts until "
+                            "this is corrected",
+                            "memory_part_of_user = 1.01 should be a part above 0, up to 1; the default counts until "
+                            "this is corrected"));
     for (const char* wrong : {"memory_mb = true", "memory_mb = \"64\"", "memory_mb = 1048577", "memory_mb = nan",
                               "memory_part_of_user = -0.5", "memory_part_of_client = false"}) {
         EXPECT_EQ(read(wrong).limits, read("").limits) << wrong;

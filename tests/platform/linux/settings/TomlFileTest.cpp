@@ -162,7 +162,10 @@ TEST_F(TomlFileTest, ComplainsOnceAboutTheSameFault)
     support::writeFile(path, "broken");
     EXPECT_FALSE(file.reload());
     EXPECT_FALSE(file.reload());
-    EXPECT_EQ(takeLines().size(), 1U);
+    const auto lines = takeLines();
+    ASSERT_EQ(lines.size(), 1U);
+    EXPECT_THAT(lines[0].message, testing::EndsWith("; the defaults apply until this is corrected"))
+        << "it never had a content";
 }
 
 TEST_F(TomlFileTest, AFileThatIsTooLargeIsNotRead)
@@ -175,7 +178,9 @@ TEST_F(TomlFileTest, AFileThatIsTooLargeIsNotRead)
     EXPECT_THAT(
         takeLines(),
         ElementsAre(Field(&support::LogLine::message,
-                          path.string() + " cannot be read: File too large; its earlier content stays in force")));
+                          path.string()
+                              + " cannot be read: File too large; the file's earlier content stays in force until this "
+                                "is corrected")));
 }
 
 TEST_F(TomlFileTest, AFileOfTheLargestSizeIsRead)

@@ -29,17 +29,19 @@ TEST(AnalyticsConfigurationTest, NothingSaidIsTheDefault)
     EXPECT_EQ(configuration.maximumAgeDays, 90);
     EXPECT_EQ(configuration.maximumSizeMegabytes, 256U);
     EXPECT_EQ(configuration.synchronization, StoreSynchronization::Normal);
+    EXPECT_TRUE(configuration.stretches);
     EXPECT_THAT(problems, IsEmpty());
 }
 
 TEST(AnalyticsConfigurationTest, EverythingCanBeSaid)
 {
     const auto [configuration, problems] = read("used = [\"a.*\", \"b\"]\nmaximum_age_days = 0.5\nmaximum_size_mb = 1\n"
-                                                "synchronous = \"full\"\n");
+                                                "synchronous = \"full\"\nstretches = false\n");
     EXPECT_THAT(configuration.used, ElementsAre("a.*", "b"));
     EXPECT_EQ(configuration.maximumAgeDays, 0.5);
     EXPECT_EQ(configuration.maximumSizeMegabytes, 1U);
     EXPECT_EQ(configuration.synchronization, StoreSynchronization::Full);
+    EXPECT_FALSE(configuration.stretches);
     EXPECT_THAT(problems, IsEmpty());
     EXPECT_THAT(read("used = []").configuration.used, IsEmpty());
     EXPECT_EQ(read("synchronous = \"normal\"").configuration.synchronization, StoreSynchronization::Normal);
@@ -52,20 +54,24 @@ TEST(AnalyticsConfigurationTest, WhatIsWrongHasItsDefaultAndALine)
     EXPECT_EQ(configuration, AnalyticsConfiguration());
     EXPECT_THAT(
         problems,
-        ElementsAre("maximum_age_days = 0 should be a number of days above 0",
-                    "maximum_size_mb = 0.5 should be a number of megabytes from 1 to 1048576",
-                    "maximum_sizemb = 3 should be nothing: the keys are used, maximum_age_days, maximum_size_mb "
-                    "and synchronous",
-                    "synchronous = off should be \"normal\" or \"full\"",
-                    "used = [1] should be a list of patterns such as [\"com.quarn.*\"]"));
+        ElementsAre(
+            "maximum_age_days = 0 should be a number of days above 0; the default counts until this is corrected",
+            "maximum_size_mb = 0.5 should be a number of megabytes from 1 to 1048576; the default counts until "
+            "this is corrected",
+            "unknown key maximum_sizemb, ignored; the keys are enabled, used, maximum_age_days, maximum_size_mb, "
+            "synchronous, stretches",
+            "synchronous = off should be \"normal\" or \"full\"; the default counts until this is corrected",
+            "used = [1] should be a list of patterns such as [\"com.quarn.*\"]; the default counts until this "
+            "is corrected"));
 }
 
 TEST(AnalyticsConfigurationTest, NumbersOutOfRangeAreWrong)
 {
-    for (const char* text : {"maximum_size_mb = -1", "maximum_size_mb = inf", "maximum_size_mb = nan",
-                             "maximum_size_mb = 1048577", "maximum_size_mb = true", "maximum_size_mb = \"1\"",
-                             "maximum_age_days = -1", "maximum_age_days = nan", "maximum_age_days = true", "used = 1",
-                             "used = \"com.*\"", "used = {a = 1}", "synchronous = 1", "synchronous = true"}) {
+    for (const char* text :
+         {"maximum_size_mb = -1", "maximum_size_mb = inf", "maximum_size_mb = nan", "maximum_size_mb = 1048577",
+          "maximum_size_mb = true", "maximum_size_mb = \"1\"", "maximum_age_days = -1", "maximum_age_days = nan",
+          "maximum_age_days = true", "used = 1", "used = \"com.*\"", "used = {a = 1}", "synchronous = 1",
+          "synchronous = true", "stretches = 0", "stretches = \"false\""}) {
         EXPECT_EQ(read(text).problems.size(), 1U) << text;
         EXPECT_EQ(read(text).configuration, AnalyticsConfiguration()) << text;
     }

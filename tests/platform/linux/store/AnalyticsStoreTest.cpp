@@ -176,6 +176,20 @@ TEST_F(AnalyticsStoreTest, AnEventOutsideATurnIsKeptWithoutAnybodyAsking)
     EXPECT_EQ(storedEvents(), 1);
 }
 
+TEST_F(AnalyticsStoreTest, AnEventOutsideATurnHasItsSourceBeforeTheTurnThatAnnouncesItEnds)
+{
+    const SourceBegin player{.number = 7, .userIdentifier = 1000, .processIdentifier = 77, .processName = "player"};
+    Turn turn;
+    turn.events.announce(player);
+    store().sendAnalyticsEventLazy(outsideTurn, player, eventName, [] { return Dictionary(); });
+    store().flush();
+    EXPECT_EQ(StoreReader(file).text("SELECT e.name || ' ' || s.name FROM events e JOIN sources s ON s.id = e.source"),
+              "com.quarn.kesto.Playback.Start player");
+    store().endTurn(turn, nullptr);
+    closeStore();
+    EXPECT_EQ(StoreReader(file).text("SELECT count(*) FROM sources"), "1");
+}
+
 // Keeps the first events only when it may go on.
 class SlowKeeper final : public support::MemoryKeeper {
 public:
@@ -221,24 +235,23 @@ TEST_F(AnalyticsStoreTest, ChargesWhatItGivesUpAlsoToThoseWhoCameSinceItsThreadH
     auto slow = std::make_unique<SlowKeeper>(std::make_shared<support::KeptEvents>(), clock);
     SlowKeeper& keeper = *slow;
     AnalyticsStore tested(std::move(slow), watcher, clock, ledger, ProviderLog(log), limits);
-    const auto sendFrom = [&](std::uint64_t source) {
-        tested.sendAnalyticsEventLazy(outsideTurn, {.source = source, .session = 0}, eventName,
-                                      [] { return Dictionary(); });
+    const auto sendFrom = [&](const SourceBegin& source) {
+        tested.sendAnalyticsEventLazy(outsideTurn, source, eventName, [] { return Dictionary(); });
     };
-    const auto begin = [&](std::uint64_t source, const char* process) {
+    const auto sendInTurn = [&](const SourceBegin& source) {
         Turn turn;
-        turn.events.announce(SourceBegin{.number = source, .userIdentifier = 1000, .processName = process});
+        turn.events.announce(source);
+        tested.sendAnalyticsEventLazy(turn, {.source = source.number, .session = 0}, eventName,
+                                      [] { return Dictionary(); });
         tested.endTurn(turn, nullptr);
     };
-    begin(7, "player");
-    tested.flush();
-    sendFrom(7);
+    const SourceBegin player{.number = 7, .userIdentifier = 1000, .processName = "player"};
+    sendFrom(player);
     keeper.isKeeping.get_future().wait();
-    sendFrom(7);
-    begin(8, "recorder");
-    sendFrom(8);
-    sendFrom(99);
-    EXPECT_EQ(tested.giveUp(), 4U);
+    sendFrom(player);
+    sendInTurn({.number = 8, .userIdentifier = 1000, .processName = "recorder"});
+    sendFrom({});
+    EXPECT_EQ(tested.giveUp(), 4U) << "one of them of no known source";
     keeper.goesOn.set_value();
     const auto lost = ledger.account().culprits[static_cast<std::size_t>(ledger::Charge::Lost)];
     ASSERT_EQ(lost.size(), 2U);

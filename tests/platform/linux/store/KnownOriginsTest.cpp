@@ -30,6 +30,18 @@ TEST(KnownOriginsTest, OneThatEndedIsRememberedUntilAThousandMoreHaveEnded)
     EXPECT_NE(known.find(2), nullptr);
 }
 
+TEST(KnownOriginsTest, OnlyWhatChangedIsWrittenAgain)
+{
+    Known known;
+    known.begin({.number = 1, .processName = "player"});
+    known.setRow(1, 1);
+    known.committed();
+    known.begin({.number = 1, .processName = "player"});
+    EXPECT_THAT(known.changed(), IsEmpty());
+    known.begin({.number = 1, .processName = "recorder"});
+    EXPECT_THAT(known.changed(), ElementsAre(1));
+}
+
 TEST(KnownOriginsTest, ADatabaseThatStaysClosedCostsNoMemory)
 {
     Known known;

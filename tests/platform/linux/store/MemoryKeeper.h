@@ -51,6 +51,7 @@ public:
     }
     void setWaker(std::function<void()>) override { }
     void open() override { }
+    void beginEnd() override { }
     void prepareForEnd() override { }
     void keep(platform::EventBatch& events, ledger::Tally& tally) override
     {

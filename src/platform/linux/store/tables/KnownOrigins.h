@@ -35,9 +35,9 @@ public:
     void begin(const Begin& begin)
     {
         auto& known = known_[begin.number];
-        known.begin = begin;
-        if (known.row != 0)
+        if (known.row != 0 && known.begin != begin)
             changed_.push_back(begin.number);
+        known.begin = begin;
     }
 
     void end(const OriginEnd& end)

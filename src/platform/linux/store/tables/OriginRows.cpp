@@ -19,8 +19,12 @@ StoreExpected<OriginRows> OriginRows::open(SqliteConnection& connection)
          " VALUES (?, ?, ?, ?, ?, ?, ?, ?)"},
         {&rows.closeSources_, "UPDATE sources SET past = ? WHERE past IS NULL"},
         {&rows.closeSessions_, "UPDATE sessions SET past = ? WHERE past IS NULL"},
-        {&rows.removeSources_, "DELETE FROM sources WHERE past <= (SELECT min(id) FROM messages)"},
-        {&rows.removeSessions_, "DELETE FROM sessions WHERE past <= (SELECT min(id) FROM messages)"}};
+        {&rows.removeSources_,
+         "DELETE FROM sources WHERE past <= (SELECT min(id) FROM messages)"
+         " AND past <= (SELECT coalesce(min(id), past) FROM stretches)"},
+        {&rows.removeSessions_,
+         "DELETE FROM sessions WHERE past <= (SELECT min(id) FROM messages)"
+         " AND past <= (SELECT coalesce(min(id), past) FROM stretches)"}};
     for (const auto& [statement, sql] : wanted) {
         auto prepared = connection.prepare(sql);
         if (!prepared)

@@ -26,7 +26,7 @@ public:
     [[nodiscard]] StoreExpected<Rows> of(const Origin& origin, KnownOrigins& known, StoreCounts& counts);
     // Writes the rows of sources and sessions that changed or ended.
     [[nodiscard]] StoreExpected<> writeChanges(KnownOrigins& known, const StoreCounts& counts);
-    // Removes the rows that no event refers to any more.
+    // Removes the rows that no event and no stretch refers to any more.
     [[nodiscard]] StoreExpected<> removeUnused();
 
 private:

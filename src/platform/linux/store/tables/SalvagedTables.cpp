@@ -12,7 +12,8 @@ namespace {
 constexpr const char* prepareTables = "DROP TABLE IF EXISTS saved_store;"
                                       "CREATE TABLE saved_store AS SELECT * FROM store LIMIT 0;";
 
-// {0}: the last number of an event; {1}: how many more there may be without a count of the database's own.
+// {0}: the last number of an event; {1}: how many more there may be without a count of the database's own. Stretches
+// that ran are left: a row that was removed long ago may be readable again, and would have become far too long.
 constexpr std::string_view goOn =
     "BEGIN IMMEDIATE;"
     "UPDATE store SET"
@@ -28,6 +29,7 @@ constexpr std::string_view goOn =
     " WHERE age_time < (SELECT age_time FROM saved_store);"
     "UPDATE store SET age_time = max(age_time, (SELECT coalesce(max(kept), 0) FROM ages));"
     "DROP TABLE saved_store;"
+    "DELETE FROM open_stretches;"
     "INSERT INTO kinds(id, name) SELECT 1000000 + coalesce(max(id), 0), '' FROM kinds"
     " HAVING NOT EXISTS (SELECT * FROM kinds WHERE name = '');"
     "INSERT INTO holders(id, process, application, bytes, oldest)"
@@ -42,8 +44,11 @@ constexpr const char* complete =
     " SELECT (SELECT min(kind) FROM messages WHERE kind > used.kind) FROM used WHERE used.kind IS NOT NULL)"
     " INSERT OR IGNORE INTO kinds(id, name) SELECT kind, 'unknown' FROM used WHERE kind IS NOT NULL;"
     "INSERT OR IGNORE INTO holders(id, process, application, bytes, oldest)"
-    " SELECT holder, 'unknown ' || holder, '', sum(length(CAST(payload AS BLOB)) + 64), min(id) FROM messages"
-    " WHERE holder NOT IN (SELECT id FROM holders) GROUP BY holder;"
+    " SELECT holder, 'unknown ' || holder, '', sum(bytes + 64), min(id) FROM"
+    " (SELECT id, holder, length(CAST(payload AS BLOB)) AS bytes FROM messages"
+    " WHERE holder NOT IN (SELECT id FROM holders) UNION ALL"
+    " SELECT id, holder, coalesce(length(CAST(device AS BLOB)), 0) + coalesce(length(CAST(format AS BLOB)), 0)"
+    " FROM stretches WHERE holder NOT IN (SELECT id FROM holders)) GROUP BY holder;"
     "DELETE FROM kinds WHERE name = '';"
     "DELETE FROM holders WHERE application = 'place of holders' AND process = '';"
     "UPDATE store SET removed = (SELECT coalesce(sum(n * (1 + (second_name IS NOT NULL))), 0)"

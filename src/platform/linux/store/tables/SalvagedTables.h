@@ -25,6 +25,12 @@ public:
         return table == "messages" || table == "first_edition" || table == "events"; // the first edition's name for it
     }
 
+    // Whether its rows have numbers of the same sequence as events.
+    [[nodiscard]] static bool isNumberedAsEvents(std::string_view table) noexcept
+    {
+        return holdsEvents(table) || table == "stretches";
+    }
+
     // Makes the tables that the rows may need.
     [[nodiscard]] static StoreExpected<> prepare(SqliteConnection& connection);
     // When the small tables are copied and before new events come, which get numbers above `last`. Also above what the

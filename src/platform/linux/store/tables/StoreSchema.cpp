@@ -57,6 +57,18 @@ constexpr std::string_view tables =
     ") STRICT;"
     "CREATE TABLE ages(below INTEGER PRIMARY KEY, kept REAL NOT NULL) STRICT;";
 
+// Versions of this edition that do not know them leave them alone.
+constexpr std::string_view laterTables =
+    "CREATE TABLE IF NOT EXISTS stretches("
+    "id INTEGER PRIMARY KEY, holder INTEGER NOT NULL, session INTEGER, recording INTEGER NOT NULL,"
+    " began REAL NOT NULL, seconds REAL NOT NULL, device TEXT, format TEXT, channels INTEGER, volume REAL,"
+    " ending TEXT NOT NULL"
+    ") STRICT;"
+    "CREATE TABLE IF NOT EXISTS open_stretches("
+    "id INTEGER PRIMARY KEY, holder INTEGER NOT NULL, session INTEGER, recording INTEGER NOT NULL,"
+    " began REAL NOT NULL, arrived REAL NOT NULL, device TEXT, format TEXT, channels INTEGER, volume REAL"
+    ") STRICT;";
+
 constexpr std::string_view view =
     "CREATE VIEW events(id, time, name, payload, session, source, happened) AS "
     "SELECT m.id, m.time, k.name, m.payload, m.session, m.source, m.happened"
@@ -85,8 +97,8 @@ StoreExpected<> takeOver(SqliteConnection& connection)
     if (!connection.prepare("SELECT id, time, name, payload FROM events"))
         return std::unexpected(StoreError::Corrupt);
     const auto done =
-        connection.execute(transaction(fmt::format("ALTER TABLE events RENAME TO first_edition; {} {}; {}{}", tables,
-                                                   takeOverFirstEdition, view, withFirstEdition))
+        connection.execute(transaction(fmt::format("ALTER TABLE events RENAME TO first_edition; {}{} {}; {}{}", tables,
+                                                   laterTables, takeOverFirstEdition, view, withFirstEdition))
                                .c_str());
     if (!done)
         connection.rollBack();
@@ -102,7 +114,7 @@ StoreExpected<> StoreSchema::make(SqliteConnection& connection)
     if (!objects)
         return std::unexpected(objects.error());
     if (*version == edition)
-        return {};
+        return connection.execute(std::string(laterTables).c_str());
     if (*version > edition)
         return std::unexpected(StoreError::Newer);
     if (*version == 1)
@@ -112,7 +124,7 @@ StoreExpected<> StoreSchema::make(SqliteConnection& connection)
     // Both take effect only before the first page is written.
     if (const auto done = connection.execute(std::string(beforeTheFirstPage).c_str()); !done)
         return done;
-    return connection.execute(transaction(fmt::format("{} {}", tables, view)).c_str());
+    return connection.execute(transaction(fmt::format("{}{} {}", tables, laterTables, view)).c_str());
 }
 
 StoreExpected<> StoreSchema::makeFirstEdition(SqliteConnection& connection)

@@ -32,7 +32,8 @@ public:
     static constexpr std::int64_t edition = 2;
 
     // Makes the tables in an empty file. A file of the first edition gets them beside its events, at once, however many
-    // it has: `FirstEdition` moves them later. Newer: a later edition; Corrupt: not a database of events.
+    // it has: `FirstEdition` moves them later. A file of this edition gets the tables that it lacks. Newer: a later
+    // edition; Corrupt: not a database of events.
     [[nodiscard]] static StoreExpected<> make(SqliteConnection& connection);
     // Makes an empty table of the first edition, and lets the view show it.
     [[nodiscard]] static StoreExpected<> makeFirstEdition(SqliteConnection& connection);
