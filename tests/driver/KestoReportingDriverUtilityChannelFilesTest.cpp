@@ -58,8 +58,10 @@ protected:
     const support::TemporaryDirectory directory;
     const fs::path root = directory.path() / "channels";
     support::TestPlatform fakes;
+    // A slow machine may take longer than the service would.
+    static constexpr platform::ChannelTree::Limits unhurried{.time = std::chrono::minutes(10)};
     platform::LinuxReportingChannels channels{root, directory.path() / "asound", fakes.ledger,
-                                              platform::ProviderLog(fakes.log)};
+                                              platform::ProviderLog(fakes.log), unhurried};
     std::shared_ptr<KestoReportingSession> session =
         std::make_shared<KestoReportingSession>(42, std::vector<std::int32_t>{7});
     std::optional<KestoReportingDriverUtility> utility;

@@ -100,6 +100,7 @@ public:
         options.socketPath = options_.socket;
         options.queueBytes = queueBytes;
         options.wakeOnSend = true; // a person may wait for each answer, and system calls do no harm here
+        options.stamp = false; // a message is sent as it stands in its line
         options.stateChanged = [this](const kesto::StateChange& change) { stateChanged(change); };
         if (const auto status = client_.open(options); status != kesto::Status::Ok) {
             fmt::print(stderr, "kesto client: {}\n", kesto::errorText(status));

@@ -87,8 +87,11 @@ void EventStore::open()
 // Returns the error of the open database and closes it.
 EventStoreError EventStore::unreadable()
 {
+    const bool isForbidden = ::access(path_.c_str(), R_OK) != 0 && errno == EACCES;
     EventStoreError error(fmt::format("cannot read the event store {}: {}", path_.native(),
-                                      database_ ? sqlite3_errmsg(database_.get()) : "out of memory"));
+                                      isForbidden     ? "permission denied: members of the group kesto may read it"
+                                          : database_ ? sqlite3_errmsg(database_.get())
+                                                      : "out of memory"));
     database_.reset();
     return error;
 }

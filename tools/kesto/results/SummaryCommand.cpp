@@ -142,9 +142,9 @@ private:
             const Value* value = volumeEvent.find(key);
             return value == nullptr ? std::string("?") : shownText(*value);
         };
-        const std::string line = fmt::format("volume event {} of {}: {} s at volume {}, {} to {}", text("msgidx"),
-                                             text("msgcnt"), text("play_seconds"), text("PomoSessionVolume"),
-                                             text("session_selected_format"), text("active_devices"));
+        const std::string line = fmt::format(
+            "volume event {} of {}: {} s at volume {}, format {}, device {}", text("msgidx"), text("msgcnt"),
+            text("play_seconds"), text("PomoSessionVolume"), text("session_selected_format"), text("active_devices"));
         fmt::print("{}\n", fitted(printable(line), width_));
     }
 

@@ -63,7 +63,7 @@ void addTraceCommand(CLI::App& application, int& exitStatus)
         if (isRecording && file->count() + json->count() != 0)
             throw CLI::ExcludesError("record", file->count() != 0 ? "FILE" : "--json");
         if (!isRecording && file->count() == 0)
-            throw CLI::RequiredError("FILE");
+            throw CLI::ValidationError("name a results file, or record a trace: kesto trace record --help");
         if (isRecording) {
             options->recording.command = commandOf(*record, options->program);
             exitStatus = recordTrace(options->recording);

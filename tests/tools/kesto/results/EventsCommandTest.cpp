@@ -241,9 +241,11 @@ TEST_F(EventsCommand, SaysThatItMayNotReadTheStore)
     makeStore({"a"});
     tool.giveUpRights();
     fs::permissions(store, fs::perms(0000));
-    expectFailure("cannot read the event store " + store.native() + ": unable to open database file");
+    expectFailure("cannot read the event store " + store.native()
+                  + ": permission denied: members of the group kesto may read it");
     fs::permissions(store.parent_path(), fs::perms(0000));
-    expectFailure("cannot read the event store " + store.native());
+    expectFailure("cannot read the event store " + store.native()
+                  + ": permission denied: members of the group kesto may read it");
     fs::permissions(store.parent_path(), fs::perms(0755));
 }
 

@@ -68,8 +68,8 @@ TEST_F(SummaryCommand, IsATimelineOfWhatChanged)
 played       0:00.500 to 0:06.605     6.105 s
 played    1:01:39.500 to 1:01:49.500  10.000 s
 played                   in all       16.105 s
-volume event 1 of 2: 2.105 s at volume 1, S16LE/44100/2 to sink
-volume event ? of ?: 4 s at volume ?, ? to ?
+volume event 1 of 2: 2.105 s at volume 1, format S16LE/44100/2, device sink
+volume event ? of ?: 4 s at volume ?, format ?, device ?
 )");
 }
 
@@ -194,7 +194,7 @@ TEST(SummaryRoad, TheFileOfARealSessionIsReadBack)
     EXPECT_THAT(shown, HasSubstr("    0:10.600  ■  Playback Stop              session_output_running=false\n"));
     EXPECT_THAT(shown, HasSubstr("\n3 messages in 0:10.600 from 1970-01-01 00:00:10\n"));
     EXPECT_THAT(shown, HasSubstr("played       0:00.000 to 0:10.600     10.600 s\n"));
-    EXPECT_THAT(shown, HasSubstr("volume event 1 of 1: 10.6 s at volume 0.5, unknown to unknown\n"));
+    EXPECT_THAT(shown, HasSubstr("volume event 1 of 1: 10.6 s at volume 0.5, format unknown, device unknown\n"));
 }
 
 } // namespace

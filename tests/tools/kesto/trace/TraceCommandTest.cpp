@@ -140,6 +140,13 @@ TEST_F(TraceCommand, SaysWhatIsMissingBesideTheTableAndEndsWithAStatusOfItsOwn)
     }
 }
 
+TEST_F(TraceCommand, SaysWhatToDoWithoutAFile)
+{
+    const Finished finished = tool.run({"trace"});
+    EXPECT_NE(finished.status, 0);
+    EXPECT_THAT(finished.errors, StartsWith("name a results file, or record a trace: kesto trace record --help\n"));
+}
+
 TEST_F(TraceCommand, FailsOnWhatIsNotAResultsFile)
 {
     const auto expectFailure = [this](const std::string& file, const std::string& reason) {
