@@ -5,6 +5,7 @@
 #include "end_to_end/WireClient.h"
 #include "support/MessageKinds.h"
 
+#include <chrono>
 #include <csignal>
 #include <cstdlib>
 #include <fstream>
@@ -165,6 +166,30 @@ TEST_F(StretchesEndTest, AClientThatVanishesEndsIt)
     (void)kestod.waitForEvents("com.quarn.kesto.kestoreportingclientuptime");
     EXPECT_TRUE(waitUntil([this] { return !endings().empty(); }));
     EXPECT_THAT(endings(), ElementsAre("0.5 vanished 1"));
+}
+
+// It says since when it has been playing, as libkesto does after it connected again.
+TEST_F(StretchesEndTest, WhatGoesOnAfterItsConnectionBrokeCountsOnce)
+{
+    const double start = std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+    const auto says = [start](bool runs, double time) {
+        return Dictionary{{"session_output_running", runs}, {"kestoreporting_timestamp", start + time}};
+    };
+    {
+        WireClient client(kestod.socketPath());
+        begin(client, 1);
+        send(client, playback, typeStart, says(true, 0));
+    }
+    EXPECT_TRUE(waitUntil([this] { return !kestod.query("SELECT 1 FROM stretches").empty(); }));
+    WireClient again(kestod.socketPath());
+    begin(again, 1);
+    send(again, playback, typeStart, says(true, 0));
+    send(again, playback, typeStop, says(false, 200));
+    EXPECT_THAT(kestod.query("SELECT ending FROM stretches ORDER BY id"), ElementsAre("vanished", "stopped"));
+    EXPECT_THAT(kestod.query("SELECT round(max(began + seconds) - min(began), 3) FROM stretches"), ElementsAre("200.0"));
+    EXPECT_THAT(kestod.query("SELECT a.began + a.seconds <= b.began FROM stretches a, stretches b"
+                             " WHERE a.ending = 'vanished' AND b.ending = 'stopped'"),
+                ElementsAre("1"));
 }
 
 TEST_F(StretchesEndTest, TheServicesEndEndsIt)

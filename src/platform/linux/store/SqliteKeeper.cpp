@@ -196,11 +196,8 @@ void SqliteKeeper::followStretches(std::span<const EventRow> rows, const OriginA
 {
     if (!configuration_.stretches)
         return;
-    const auto isAlive = [this](std::uint64_t session) {
-        const auto* const known = origins_.sessions.find(session);
-        return known != nullptr && !known->ended;
-    };
-    stretches_.take(rows, announced, isAlive, isServiceEnding_ ? StretchEnding::ServiceEnded : StretchEnding::Vanished);
+    const auto ownerOf = [this](std::uint64_t session) { return origins_.ownerOf(session); };
+    stretches_.take(rows, announced, ownerOf, isServiceEnding_ ? StretchEnding::ServiceEnded : StretchEnding::Vanished);
 }
 
 void SqliteKeeper::countStretches(ledger::Tally& tally)

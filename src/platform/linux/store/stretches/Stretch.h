@@ -64,6 +64,16 @@ struct Stretch {
     friend bool operator==(const Stretch&, const Stretch&) = default;
 };
 
+// Whose a session is. One with the same owner as an earlier one is its continuation: its client's connection broke, and
+// the client made the session anew.
+struct SessionOwner {
+    std::uint32_t user = 0;
+    std::int32_t process = 0;
+    std::int64_t reporterID = 0;
+
+    friend bool operator==(const SessionOwner&, const SessionOwner&) = default;
+};
+
 // A time that runs backwards is 0, and so is one that no number can hold.
 [[nodiscard]] inline double lengthOfTime(double from, double until) noexcept
 {

@@ -77,6 +77,18 @@ bool merge(PlayingState& state, const PlayingFacts& facts)
     return differs;
 }
 
+// Two clocks cannot be compared: only where both messages say when they happened, these times count. What was counted
+// before, up to the earlier end, is cut off; stamps that all lie before it are those of another clock.
+std::pair<double, double> lengthOf(const StretchMoment& began, const StretchMoment& ended,
+                                   std::optional<double> earlierEnd)
+{
+    if (!began.happened || !ended.happened)
+        return {began.time(), lengthOfTime(began.arrived, ended.arrived)};
+    const bool isCountedInPart = earlierEnd && *began.happened < *earlierEnd && *earlierEnd < *ended.happened;
+    const double from = isCountedInPart ? *earlierEnd : *began.happened;
+    return {from, lengthOfTime(from, *ended.happened)};
+}
+
 Stretches::Key keyOf(std::uint64_t session, std::size_t direction)
 {
     return 2 * session + direction;
@@ -86,7 +98,7 @@ Stretches::Key keyOf(std::uint64_t session, std::size_t direction)
 
 // --- Following the messages
 
-void Stretches::take(std::span<const EventRow> rows, const OriginAnnouncements& announced, const IsAlive& isAlive,
+void Stretches::take(std::span<const EventRow> rows, const OriginAnnouncements& announced, const OwnerOf& ownerOf,
                      StretchEnding vanished)
 {
     auto next = announced.playingEnds.begin();
@@ -97,7 +109,7 @@ void Stretches::take(std::span<const EventRow> rows, const OriginAnnouncements& 
     for (const EventRow& row : rows) {
         endBefore(row.place);
         if (row.origin.session != 0)
-            take(row, isAlive);
+            take(row, ownerOf);
     }
     endBefore(std::numeric_limits<std::size_t>::max());
     for (const OriginEnd& session : announced.sessionEnds) {
@@ -106,12 +118,12 @@ void Stretches::take(std::span<const EventRow> rows, const OriginAnnouncements& 
     }
 }
 
-void Stretches::take(const EventRow& row, const IsAlive& isAlive)
+void Stretches::take(const EventRow& row, const OwnerOf& ownerOf)
 {
     const NameSays name = meaningOf(row.name);
     if (name == NameSays::Derived || (name == NameSays::Nothing && row.playing == nullptr))
         return;
-    Session* const session = sessionOf(row.origin.session, isAlive);
+    Session* const session = sessionOf(row.origin.session, ownerOf);
     if (session == nullptr)
         return;
     constexpr PlayingFacts nothing;
@@ -147,7 +159,7 @@ void Stretches::end(std::uint64_t number, Session& session, std::size_t directio
 {
     const OpenStretch open = *std::exchange(session.open[direction], std::nullopt);
     changed_.push_back(keyOf(number, direction));
-    const auto [began, seconds] = lengthOf(open.began, when);
+    const auto [began, seconds] = lengthOf(open.began, when, std::max(earlierEnd_, session.brokenOff));
     if (seconds > 0)
         ended_.push_back({open.origin, direction == recording, began, seconds, session.state, ending});
     else
@@ -157,8 +169,12 @@ void Stretches::end(std::uint64_t number, Session& session, std::size_t directio
 void Stretches::end(std::uint64_t session, double time, StretchEnding ending)
 {
     Session* const found = find(session);
+    if (found == nullptr)
+        return;
+    if (ending == StretchEnding::Vanished && (found->open[playing] || found->open[recording]))
+        rememberBrokenOff(found->owner, time);
     for (const std::size_t direction : directions)
-        if (found != nullptr && found->open[direction])
+        if (found->open[direction])
             end(session, *found, direction, {.arrived = time, .happened = {}}, ending);
 }
 
@@ -169,17 +185,6 @@ void Stretches::endAll(double time)
     sessions_.clear();
 }
 
-// Two clocks cannot be compared: only where both messages say when they happened, these times count. What an earlier
-// run has counted is cut off; stamps that all lie before its end are those of another clock.
-std::pair<double, double> Stretches::lengthOf(const StretchMoment& began, const StretchMoment& ended) const
-{
-    if (!began.happened || !ended.happened)
-        return {began.time(), lengthOfTime(began.arrived, ended.arrived)};
-    const bool isCountedInPart = earlierEnd_ && *began.happened < *earlierEnd_ && *earlierEnd_ < *ended.happened;
-    const double from = isCountedInPart ? *earlierEnd_ : *began.happened;
-    return {from, lengthOfTime(from, *ended.happened)};
-}
-
 Stretches::Session* Stretches::find(std::uint64_t number)
 {
     const auto found = sessions_.find(number);
@@ -187,11 +192,30 @@ Stretches::Session* Stretches::find(std::uint64_t number)
 }
 
 // Null of one that does not live: no end of it would come.
-Stretches::Session* Stretches::sessionOf(std::uint64_t number, const IsAlive& isAlive)
+Stretches::Session* Stretches::sessionOf(std::uint64_t number, const OwnerOf& ownerOf)
 {
     if (Session* const session = find(number))
         return session;
-    return isAlive(number) ? &sessions_[number] : nullptr;
+    const auto owner = ownerOf(number);
+    if (!owner)
+        return nullptr;
+    Session& session = sessions_[number];
+    session.owner = *owner;
+    session.brokenOff = lastBrokenOff(*owner);
+    return &session;
+}
+
+void Stretches::rememberBrokenOff(const SessionOwner& owner, double time)
+{
+    brokenOff_.push_back({owner, time});
+    if (brokenOff_.size() > mostBrokenOff)
+        brokenOff_.pop_front();
+}
+
+std::optional<double> Stretches::lastBrokenOff(const SessionOwner& owner) const
+{
+    const auto last = std::ranges::find(brokenOff_.rbegin(), brokenOff_.rend(), owner, &BrokenOff::owner);
+    return last == brokenOff_.rend() ? std::nullopt : std::optional(last->time);
 }
 
 // --- Writing them

@@ -13,6 +13,7 @@
 #include <array>
 #include <cstddef>
 #include <cstdint>
+#include <deque>
 #include <functional>
 #include <optional>
 #include <span>
@@ -28,11 +29,13 @@ class Stretches {
 public:
     // So many may wait for a database that cannot be written to.
     static constexpr std::size_t mostWaiting = 1024;
+    // So many sessions whose connection broke are remembered, the last ones.
+    static constexpr std::size_t mostBrokenOff = 1024;
 
-    // Whether a session lives, as before the ends that the batch announces.
-    using IsAlive = std::function<bool(std::uint64_t session)>;
+    // The owner of a session, as before the ends that the batch announces; nothing if the session does not live.
+    using OwnerOf = std::function<std::optional<SessionOwner>(std::uint64_t session)>;
     // Follows the messages of a batch and what it announces. `vanished` is the ending of what a lost connection ends.
-    void take(std::span<const EventRow> rows, const OriginAnnouncements& announced, const IsAlive& isAlive,
+    void take(std::span<const EventRow> rows, const OriginAnnouncements& announced, const OwnerOf& ownerOf,
               StretchEnding vanished);
     // Everything that runs ends with the service, and no session is known any more.
     void endAll(double time);
@@ -71,20 +74,28 @@ private:
     struct Session {
         PlayingState state;
         std::array<std::optional<OpenStretch>, 2> open; // playing, recording: all in that state
+        SessionOwner owner;
+        std::optional<double> brokenOff; // until then an earlier session of the owner is counted
+    };
+    struct BrokenOff {
+        SessionOwner owner;
+        double time;
     };
     using Sessions = std::unordered_map<std::uint64_t, Session>;
 
-    void take(const EventRow& row, const IsAlive& isAlive);
+    void take(const EventRow& row, const OwnerOf& ownerOf);
     void end(std::uint64_t session, double time, StretchEnding ending);
     void end(std::uint64_t number, Session& session, std::size_t direction, const StretchMoment& when,
              StretchEnding ending);
     void begin(std::uint64_t number, Session& session, std::size_t direction, const OpenStretch& open);
-    [[nodiscard]] Session* sessionOf(std::uint64_t number, const IsAlive& isAlive);
+    [[nodiscard]] Session* sessionOf(std::uint64_t number, const OwnerOf& ownerOf);
     [[nodiscard]] Session* find(std::uint64_t number);
-    [[nodiscard]] std::pair<double, double> lengthOf(const StretchMoment& began, const StretchMoment& ended) const;
+    void rememberBrokenOff(const SessionOwner& owner, double time);
+    [[nodiscard]] std::optional<double> lastBrokenOff(const SessionOwner& owner) const;
     void sortChanged();
 
     Sessions sessions_;
+    std::deque<BrokenOff> brokenOff_; // the latest last
     std::optional<double> earlierEnd_;
     std::vector<Stretch> ended_;
     std::vector<Key> changed_; // may repeat

@@ -42,6 +42,17 @@ std::optional<ledger::Culprit> KnownOrigins::culpritOf(const Origin& origin)
                            .application = session == nullptr ? std::string() : session->begin.application};
 }
 
+std::optional<SessionOwner> KnownOrigins::ownerOf(std::uint64_t session)
+{
+    const auto* const known = sessions.find(session);
+    if (known == nullptr || known->ended)
+        return std::nullopt;
+    const auto* const source = sources.find(known->begin.source);
+    return SessionOwner{.user = source == nullptr ? 0 : source->begin.userIdentifier,
+                        .process = source == nullptr ? 0 : source->begin.processIdentifier,
+                        .reporterID = known->begin.reporterID};
+}
+
 void KnownOrigins::countLoss(ledger::Counter reason, const EventsByOrigin& events, ledger::Tally& tally)
 {
     for (const auto& [origin, count] : events)

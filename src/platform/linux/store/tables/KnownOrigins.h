@@ -9,6 +9,7 @@
 
 #include "ledger/Tally.h"
 #include "platform/Origin.h"
+#include "platform/linux/store/stretches/Stretch.h"
 
 #include <algorithm>
 #include <cstddef>
@@ -125,6 +126,8 @@ struct KnownOrigins {
     void rolledBack();
     // Who is behind the origin; nothing if its source is not known.
     [[nodiscard]] std::optional<ledger::Culprit> culpritOf(const Origin& origin);
+    // Nothing if the session is not known or has ended.
+    [[nodiscard]] std::optional<SessionOwner> ownerOf(std::uint64_t session);
     // Counts the loss of events, and charges it to those who sent them as far as they are known.
     void countLoss(ledger::Counter reason, const EventsByOrigin& events, ledger::Tally& tally);
     // Whether rows are to be written although there is no event.

@@ -14,6 +14,7 @@ using testing::IsEmpty;
 
 constexpr double began = 1'800'000'000;
 constexpr Origin player{.source = 1, .session = 7};
+constexpr SessionOwner ofPlayer{.user = 1000, .process = 4711, .reporterID = 5};
 
 // One line for each stretch: what is to be compared.
 std::string text(const Stretch& stretch)
@@ -36,9 +37,13 @@ protected:
     }
     void takeBatch(StretchEnding vanished = StretchEnding::Vanished)
     {
-        const auto isAlive = [this](std::uint64_t session) { return session == 7 && !hasEnded; };
-        stretches.take(batch.rows(), batch.announcements(), isAlive, vanished);
-        hasEnded = hasEnded || !batch.announcements().sessionEnds.empty();
+        const auto ownerOf = [this](std::uint64_t session) {
+            const auto owner = owners.find(session);
+            return owner == owners.end() ? std::nullopt : std::optional(owner->second);
+        };
+        stretches.take(batch.rows(), batch.announcements(), ownerOf, vanished);
+        for (const OriginEnd& end : batch.announcements().sessionEnds)
+            owners.erase(end.number);
         batch.clear();
     }
     std::vector<std::string> ended()
@@ -50,7 +55,7 @@ protected:
         return texts;
     }
 
-    bool hasEnded = false; // the session
+    std::map<std::uint64_t, SessionOwner> owners = {{7, ofPlayer}}; // of the sessions that live
     EventBatch batch;
     Stretches stretches;
 };
@@ -287,6 +292,101 @@ TEST_F(StretchesTest, WhatAnEarlierRunOfTheServiceCountedIsNotCountedAgain)
     EXPECT_THAT(ended(), ElementsAre("played from 100.000000 for 50.000000 on ? in ?/? at ?: stopped"));
 }
 
+// --- A session that is made anew
+
+// The player's connection breaks after 10 seconds of playing; another session says that it has played since 4 and stops
+// at 15.
+class StretchesContinuedTest : public StretchesTest {
+protected:
+    void playUntilBroken(double time = 10)
+    {
+        add(0, "Playback.Start", {});
+        breakOff(7, time);
+    }
+    void breakOff(std::uint64_t session, double time)
+    {
+        batch.announcePlayingEnd(session, began + time, PlayingEnding::Vanished);
+        batch.announceSessionEnd({.number = session, .time = began + time});
+        takeBatch();
+    }
+    std::vector<std::string> continued(const SessionOwner& owner, double since = 4, double until = 15)
+    {
+        constexpr Origin next{.source = 2, .session = 8};
+        owners[8] = owner;
+        add(since, "Playback.Start", {}, true, next);
+        add(until, "Playback.Stop", {}, true, next);
+        return ended();
+    }
+};
+
+TEST_F(StretchesContinuedTest, CountsFromWhereItsConnectionBroke)
+{
+    playUntilBroken();
+    EXPECT_THAT(continued(ofPlayer),
+                ElementsAre("played from 0.000000 for 10.000000 on ? in ?/? at ?: vanished",
+                            "played from 10.000000 for 5.000000 on ? in ?/? at ?: stopped"));
+}
+
+TEST_F(StretchesContinuedTest, CountsFromTheLastOfTwoBreaks)
+{
+    playUntilBroken(6);
+    owners[9] = ofPlayer;
+    add(0, "Playback.Start", {}, false, {.source = 3, .session = 9});
+    breakOff(9, 12);
+    EXPECT_THAT(continued(ofPlayer).back(), "played from 12.000000 for 3.000000 on ? in ?/? at ?: stopped");
+}
+
+TEST_F(StretchesContinuedTest, AnotherUserProcessOrReporterContinuesNothing)
+{
+    playUntilBroken();
+    SessionOwner anotherUser = ofPlayer;
+    SessionOwner anotherProcess = ofPlayer;
+    SessionOwner anotherReporter = ofPlayer;
+    anotherUser.user = 1001;
+    anotherProcess.process = 4712;
+    anotherReporter.reporterID = 6;
+    for (const SessionOwner& owner : {anotherUser, anotherProcess, anotherReporter}) {
+        EXPECT_THAT(continued(owner).back(), "played from 4.000000 for 11.000000 on ? in ?/? at ?: stopped");
+        batch.announceSessionEnd({.number = 8, .time = began + 15});
+        takeBatch();
+    }
+}
+
+TEST_F(StretchesContinuedTest, AStoppedSessionIsNotContinued)
+{
+    add(0, "Playback.Start", {});
+    batch.announcePlayingEnd(7, began + 10, PlayingEnding::Stopped);
+    batch.announceSessionEnd({.number = 7, .time = began + 10});
+    takeBatch();
+    EXPECT_THAT(continued(ofPlayer).back(), "played from 4.000000 for 11.000000 on ? in ?/? at ?: stopped");
+}
+
+TEST_F(StretchesContinuedTest, NorIsOneThatPlayedNothingWhenItsConnectionBroke)
+{
+    add(0, "Playback.Start", {});
+    add(5, "Playback.Stop", {});
+    breakOff(7, 10);
+    EXPECT_THAT(continued(ofPlayer, 6).back(), "played from 6.000000 for 9.000000 on ? in ?/? at ?: stopped");
+}
+
+TEST_F(StretchesContinuedTest, TheLaterEndCountsOfTheServicesAndTheConnections)
+{
+    playUntilBroken();
+    stretches.setEarlierEnd(began + 12);
+    EXPECT_THAT(continued(ofPlayer).back(), "played from 12.000000 for 3.000000 on ? in ?/? at ?: stopped");
+}
+
+TEST_F(StretchesContinuedTest, OnlyTheLastBrokenConnectionsAreRemembered)
+{
+    playUntilBroken();
+    for (std::uint64_t session = 100; session < 100 + Stretches::mostBrokenOff; ++session) {
+        owners[session] = {.user = 1000, .process = 1, .reporterID = static_cast<std::int64_t>(session)};
+        add(0, "Playback.Start", {}, true, {.source = 4, .session = session});
+        breakOff(session, 10);
+    }
+    EXPECT_THAT(continued(ofPlayer).back(), "played from 4.000000 for 11.000000 on ? in ?/? at ?: stopped");
+}
+
 // --- Ends without a message
 
 TEST_F(StretchesTest, AStoppedSessionPlaysNoMoreUntilItBeginsAgain)
@@ -417,7 +517,7 @@ TEST_F(StretchesTest, AnotherDatabaseGetsAllThatRuns)
 // starts and stops alone.
 RC_GTEST_PROP(StretchesProperty, TheLengthsAddUpToTheTimeThatOutputRan, ())
 {
-    const auto isAlive = [](std::uint64_t session) { return session == 7; };
+    const auto ownerOf = [](std::uint64_t session) { return session == 7 ? std::optional(ofPlayer) : std::nullopt; };
     Stretches stretches;
     EventBatch batch;
     const bool saysWhen = *rc::gen::arbitrary<bool>();
@@ -447,12 +547,12 @@ RC_GTEST_PROP(StretchesProperty, TheLengthsAddUpToTheTimeThatOutputRan, ())
         }
         isRunning = what < 2 || (what > 4 && isRunning);
         if (seconds % 3 == 0) {
-            stretches.take(batch.rows(), batch.announcements(), isAlive, StretchEnding::Vanished);
+            stretches.take(batch.rows(), batch.announcements(), ownerOf, StretchEnding::Vanished);
             batch.clear();
         }
     }
     batch.announceSessionEnd({.number = 7, .time = time});
-    stretches.take(batch.rows(), batch.announcements(), isAlive, StretchEnding::Vanished);
+    stretches.take(batch.rows(), batch.announcements(), ownerOf, StretchEnding::Vanished);
     double sum = 0;
     for (const Stretch& stretch : stretches.ended()) {
         RC_ASSERT(stretch.seconds > 0);
