@@ -64,7 +64,7 @@ private:
             if (auto send = turn.letters.take())
                 send();
         }
-        [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t) override
+        [[nodiscard]] std::shared_ptr<Lane> makeLane(const platform::Submitter&) override
         {
             return std::make_shared<ImmediateQueue>();
         }

@@ -204,7 +204,8 @@ private:
     const std::uint32_t userIdentifier_;
     const std::uint64_t source_ = platform::nextOriginNumber();
     const std::shared_ptr<platform::LogShare> logShare_; // of everything that the client causes
-    const std::shared_ptr<platform::Lane> queue_ = utility::serverQueue()->makeLane(userIdentifier_);
+    const std::shared_ptr<platform::Lane> queue_ =
+        utility::serverQueue()->makeLane({.user = userIdentifier_, .process = processIdentifier_});
     std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);
     std::optional<std::string> clientProcessName_ KESTO_GUARDED_BY(registrationLock_);
     client::SessionMap clientReportingSessionMap_;

@@ -18,6 +18,7 @@
 
 #include "ledger/Workload.h"
 #include "platform/LogShare.h"
+#include "platform/Submitter.h"
 #include "platform/Turn.h"
 
 #include <chrono>
@@ -60,13 +61,14 @@ public:
     // The same for an item that may take longer than a millisecond: no helper runs it, because a helper has other
     // things to do, too.
     virtual void submitLong(TurnItem item) { submit(std::move(item)); }
-    // A lane of a user. The queue must outlive the items of its lanes.
-    [[nodiscard]] virtual std::shared_ptr<Lane> makeLane(std::uint32_t user) = 0;
+    // A lane of that submitter. The queue must outlive the items of its lanes.
+    [[nodiscard]] virtual std::shared_ptr<Lane> makeLane(const Submitter& submitter) = 0;
 };
 
 // A part of a turn queue for one of many submitters, such as a client. Its items run on that queue, in their own order,
-// and take turns with those of the other lanes: first the users share the queue's time equally, then each user's lanes.
-// What is submitted to the queue itself is a lane, too, of a user of its own. Items of different lanes have no order.
+// and take turns with those of the other lanes: the users share the queue's time equally, each user's processes the
+// user's, and each process's lanes the process's. What is submitted to the queue itself is a lane, too, of a user of
+// its own. Items of different lanes have no order.
 class Lane : public TurnQueue {
 public:
     // Whether so many items wait that the submitter should pause. After it returned true, the room handler is called

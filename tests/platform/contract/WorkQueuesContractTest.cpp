@@ -124,7 +124,7 @@ TEST_P(WorkQueuesContract, WhatAnItemSubmitsToItsQueueRunsBehindWhatWaitsThereAl
 TEST_P(WorkQueuesContract, TheItemsOfALaneRunOnItsQueueInTheirOrder)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     EXPECT_FALSE(lane->isCurrent());
     lane->submit([&] { note(queue->isCurrent() && lane->isCurrent() ? "current" : "not current"); });
     lane->submitLong([&](platform::Turn&) { note("long"); });
@@ -137,7 +137,7 @@ TEST_P(WorkQueuesContract, TheItemsOfAllLanesRunOneAtATime)
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
     std::vector<std::shared_ptr<platform::Lane>> lanes;
     for (std::uint32_t user = 0; user < 4; ++user)
-        lanes.push_back(queue->makeLane(user / 2));
+        lanes.push_back(queue->makeLane({user / 2, 1}));
     int ran = 0; // no lock: one item at a time uses it
     for (int item = 0; item < 1000; ++item)
         lanes[static_cast<std::size_t>(item) % lanes.size()]->submit([&] {
@@ -151,8 +151,8 @@ TEST_P(WorkQueuesContract, TheItemsOfAllLanesRunOneAtATime)
 TEST_P(WorkQueuesContract, AnItemOfALaneMaySubmitToAnother)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
-    const auto one = queue->makeLane(1000);
-    const auto other = queue->makeLane(1001);
+    const auto one = queue->makeLane({1000, 1});
+    const auto other = queue->makeLane({1001, 1});
     int seen = 0;
     one->submit([&] {
         seen = 1;
@@ -165,8 +165,8 @@ TEST_P(WorkQueuesContract, ALaneThatPausesHoldsBackItsItemsAndNoOthers)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
     const auto elsewhere = makeQueue();
-    const auto lane = queue->makeLane(1000);
-    const auto other = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
+    const auto other = queue->makeLane({1000, 1});
     platform::Lane::Resume resume;
     lane->submitLong([&](platform::Turn&) {
         resume = lane->pause();
@@ -186,7 +186,7 @@ TEST_P(WorkQueuesContract, ALaneThatPausesHoldsBackItsItemsAndNoOthers)
 TEST_P(WorkQueuesContract, ALaneMayGoOnBeforeTheItemThatPausedItIsOver)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     lane->submitLong([&](platform::Turn&) {
         lane->pause()([&](platform::Turn&) { note("goes on"); });
         note("pauses");
@@ -199,7 +199,7 @@ TEST_P(WorkQueuesContract, ALaneMayPauseAgainAndAgain)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
     const auto elsewhere = makeQueue();
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     for (int item = 0; item < 100; ++item)
         lane->submitLong([&, item](platform::Turn&) {
             elsewhere->submit([&, item, resume = lane->pause()]() mutable {
@@ -215,7 +215,7 @@ TEST_P(WorkQueuesContract, ALaneMayPauseAgainAndAgain)
 TEST_P(WorkQueuesContract, ALaneWithFewItemsIsNotFull)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     lane->setRoomHandler([] { ADD_FAILURE() << "it was never full"; });
     lane->submit(noting("a"));
     EXPECT_FALSE(lane->isFull(0));
@@ -225,7 +225,7 @@ TEST_P(WorkQueuesContract, ALaneWithFewItemsIsNotFull)
 TEST_P(WorkQueuesContract, ALaneReleasesWhatItsItemsHoldWhenAllOfThemHaveRun)
 {
     const auto queue = subject->queues().makeTurnQueue("com.quarn.kesto.test", {});
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     std::atomic<std::size_t> released = 0;
     lane->setReleaseHandler([&](std::size_t bytes) {
         released = bytes;

@@ -28,7 +28,7 @@ public:
     {
         queues_.items_.push_back({shared_from_this(), nullptr, std::move(item)});
     }
-    [[nodiscard]] std::shared_ptr<platform::Lane> makeLane(std::uint32_t user) override;
+    [[nodiscard]] std::shared_ptr<platform::Lane> makeLane(const platform::Submitter& submitter) override;
 
     [[nodiscard]] bool isCurrent() const override
     {
@@ -55,7 +55,7 @@ public:
     {
         queues_.items_.push_back({queue_, shared_from_this(), std::move(item)});
     }
-    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user) override { return queue_->makeLane(user); }
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(const platform::Submitter& submitter) override { return queue_->makeLane(submitter); }
     [[nodiscard]] bool isCurrent() const override { return queue_->isCurrent(); }
     [[nodiscard]] bool isFull(std::size_t heldBytes) override
     {
@@ -90,7 +90,7 @@ private:
     bool isPausing_ = false;
 };
 
-std::shared_ptr<platform::Lane> FakeWorkQueues::Queue::makeLane(std::uint32_t)
+std::shared_ptr<platform::Lane> FakeWorkQueues::Queue::makeLane(const platform::Submitter&)
 {
     return std::make_shared<QueueLane>(queues_, shared_from_this());
 }

@@ -230,7 +230,7 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
         std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid, peer.gid});
     const auto reader = std::make_shared<Reader>();
     reader->connection = connection;
-    ready_.admit(*reader, peer.uid);
+    ready_.admit(*reader, {.user = peer.uid, .process = peer.pid});
     connections_.emplace(connection.get(), reader);
     {
         const foundation::Lock lock(hub_->connectionsLock);

@@ -46,10 +46,10 @@ constexpr std::size_t fewWaiting = mostWaiting / 2;
 
 } // namespace
 
-std::shared_ptr<FairOrder::Lane> FairOrder::makeLane(std::uint32_t user)
+std::shared_ptr<FairOrder::Lane> FairOrder::makeLane(const Submitter& submitter)
 {
     auto lane = std::make_shared<Lane>();
-    shares_.admit(*lane, user);
+    shares_.admit(*lane, submitter);
     return lane;
 }
 

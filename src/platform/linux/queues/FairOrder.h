@@ -1,4 +1,4 @@
-// The order in which the items of many lanes run, so that no lane and no user waits for the work of others.
+// The order in which the items of many lanes run, so that no lane, process or user waits for the work of others.
 //
 // A lane is a sequence of items, such as the calls of one client. The time of those that run decides whose are next
 // (see FairShares).
@@ -30,7 +30,7 @@ public:
     using RoomHandler = std::function<void()>;
     using ReleaseHandler = std::function<void(std::size_t bytes)>;
 
-    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user);
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(const Submitter& submitter);
     void add(const std::shared_ptr<Lane>& lane, Item item);
 
     // Whether so many items of the lane wait that its submitter should pause. `take` then says when few are left. What

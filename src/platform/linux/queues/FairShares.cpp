@@ -1,41 +1,53 @@
-// A user takes part among the users as a share does among those of its user.
+// The users are a tree with their processes and shares; each node takes part in the contest of its group in the same
+// way.
 #include "platform/linux/queues/FairShares.h"
 
 #include <algorithm>
 #include <utility>
 
 namespace platform {
+namespace {
 
-struct FairShares::User {
-    Duration used{};
-    Duration now{}; // what the share that was served last had used before
-    Contest<Share> shares;
-};
-
-// A share that waits and its user own each other.
-FairShares::~FairShares()
+// A node that waits and its group own each other.
+void clear(FairShares::Node& node)
 {
-    for (const auto& [used, user] : contest_)
-        user->shares.clear();
+    for (const auto& [used, member] : std::exchange(node.contest, {}))
+        clear(*member);
 }
 
-void FairShares::admit(Share& share, std::uint32_t user)
+} // namespace
+
+FairShares::~FairShares()
 {
-    std::weak_ptr<User>& known = users_[user];
-    share.user = known.lock();
-    if (share.user != nullptr)
-        return;
-    known = share.user = std::make_shared<User>();
-    std::erase_if(users_, [](const auto& each) { return each.second.expired(); });
+    clear(*root_);
+}
+
+void FairShares::admit(Share& share, const Submitter& submitter)
+{
+    const auto user = groupOf({submitter.user, std::nullopt}, root_);
+    share.group = groupOf({submitter.user, submitter.process}, user);
+}
+
+std::shared_ptr<FairShares::Node> FairShares::groupOf(const GroupKey& key, const std::shared_ptr<Node>& in)
+{
+    std::weak_ptr<Node>& known = groups_[key];
+    if (auto group = known.lock())
+        return group;
+    auto group = std::make_shared<Node>(Node{.group = in, .used = {}, .now = {}, .contest = {}});
+    known = group;
+    if (groups_.size() > mostGroups_) {
+        std::erase_if(groups_, [](const auto& each) { return each.second.expired(); });
+        mostGroups_ = 2 * groups_.size();
+    }
+    return group;
 }
 
 void FairShares::enter(const std::shared_ptr<Share>& share)
 {
     if (std::exchange(share->wantsTime, true))
         return;
-    User& user = *share->user;
-    share->used = std::max(share->used, user.now);
-    user.used = std::max(user.used, now_); // changes nothing for one that competes already
+    for (Node* node = share.get(); node != root_.get(); node = node->group.get())
+        node->used = std::max(node->used, node->group->now); // changes nothing for one that competes already
     if (isEmpty()) {
         only_ = share;
         return;
@@ -45,55 +57,61 @@ void FairShares::enter(const std::shared_ptr<Share>& share)
     compete(share);
 }
 
-void FairShares::compete(const std::shared_ptr<Share>& share)
+void FairShares::compete(const std::shared_ptr<Node>& node)
 {
-    const auto& user = share->user;
-    if (user->shares.empty())
-        contest_.emplace(user->used, user);
-    user->shares.emplace(share->used, share);
+    const auto& group = node->group;
+    if (group->contest.empty() && group != root_)
+        compete(group);
+    group->contest.emplace(node->used, node);
 }
 
 bool FairShares::isContested() const
 {
-    return contest_.size() > 1 || (!contest_.empty() && contest_.begin()->second->shares.size() > 1);
+    for (const Node* node = root_.get(); !node->contest.empty(); node = node->contest.begin()->second.get())
+        if (node->contest.size() > 1)
+            return true;
+    return false;
 }
 
 FairShares::Share& FairShares::first() const
 {
-    return only_ != nullptr ? *only_ : *contest_.begin()->second->shares.begin()->second;
+    if (only_ != nullptr)
+        return *only_;
+    Node* node = root_.get();
+    while (!node->contest.empty())
+        node = node->contest.begin()->second.get();
+    return static_cast<Share&>(*node);
 }
 
 FairShares::Share& FairShares::serveFirst()
 {
     Share& share = first();
-    now_ = share.user->used;
-    share.user->now = share.used;
+    for (Node* node = &share; node != root_.get(); node = node->group.get())
+        node->group->now = node->used;
     return share;
-}
-
-// The first goes to its new place, or leaves.
-template <typename Each> void FairShares::chargeFirst(Contest<Each>& contest, Duration time, bool wantsMore)
-{
-    auto first = contest.extract(contest.begin());
-    first.mapped()->used += time;
-    first.key() = first.mapped()->used;
-    if (wantsMore)
-        contest.insert(std::move(first));
 }
 
 void FairShares::charge(Duration time, bool wantsMore)
 {
-    first().wantsTime = wantsMore;
-    if (only_ != nullptr) {
-        only_->used += time;
-        only_->user->used += time;
-        if (!wantsMore)
-            only_.reset();
-        return;
-    }
-    User& user = *contest_.begin()->second;
-    chargeFirst(user.shares, time, wantsMore);
-    chargeFirst(contest_, time, !user.shares.empty());
+    Share& share = first();
+    share.wantsTime = wantsMore;
+    for (Node* node = &share; node != root_.get(); node = node->group.get())
+        node->used += time;
+    if (only_ == nullptr)
+        moveFirst(*share.group, wantsMore);
+    else if (!wantsMore)
+        only_.reset();
+}
+
+// The first of the group goes to its new place, or leaves, and so does the group.
+void FairShares::moveFirst(Node& group, bool wantsMore)
+{
+    auto first = group.contest.extract(group.contest.begin());
+    first.key() = first.mapped()->used;
+    if (wantsMore)
+        group.contest.insert(std::move(first));
+    if (&group != root_.get())
+        moveFirst(*group.group, !group.contest.empty());
 }
 
 } // namespace platform

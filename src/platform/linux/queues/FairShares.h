@@ -1,15 +1,21 @@
 // Who comes next when many share the time of one thread, so that no one waits for the work of others.
 //
-// A share is what one client wants of that time; it belongs to a user. Next comes the user whose shares have taken the
-// least time so far, and among the user's shares the one that took the least: start-time fair queueing (P. Goyal, H. M.
-// Vin, H. Cheng, 1996) at two levels. A share or user that wanted nothing for a while goes on where the others are now:
-// a pause earns no time to be used at once later, and costs none.
+// A share is what one connection wants of that time. Next comes the user whose shares have taken the least time so far,
+// among the user's processes the one that took the least, and among the process's shares again: start-time fair
+// queueing (P. Goyal, H. M. Vin, H. Cheng, 1996) at three levels. So a process gains nothing by many connections. Who
+// wanted nothing for a while goes on where the others are now: a pause earns no time to be used at once later, and
+// costs none.
 #pragma once
 
+#include "platform/Submitter.h"
+
 #include <chrono>
+#include <cstddef>
 #include <cstdint>
 #include <map>
 #include <memory>
+#include <optional>
+#include <utility>
 
 namespace platform {
 
@@ -18,11 +24,19 @@ class FairShares {
 public:
     using Duration = std::chrono::nanoseconds;
 
-    struct User;
-    // What takes part derives from this, and leaves it to this class.
-    struct Share {
-        std::shared_ptr<User> user;
+    struct Node;
+    // Those of a node that want time, by the time that they used. Who is being served stays at the front: all others
+    // come in behind.
+    using Contest = std::multimap<Duration, std::shared_ptr<Node>>;
+    // A user, a process, or a share.
+    struct Node {
+        std::shared_ptr<Node> group; // that it takes part in; null: it is the root
         Duration used{};
+        Duration now{}; // what the one in it that was served last had used before
+        Contest contest; // empty in a share
+    };
+    // What takes part derives from this, and leaves it to this class.
+    struct Share : Node {
         bool wantsTime = false; // or is being served
     };
 
@@ -32,11 +46,11 @@ public:
     FairShares& operator=(const FairShares&) = delete;
 
     // Once for each share, first.
-    void admit(Share& share, std::uint32_t user);
+    void admit(Share& share, const Submitter& submitter);
     // The share wants time, until it is charged as one that wants no more.
     void enter(const std::shared_ptr<Share>& share);
 
-    [[nodiscard]] bool isEmpty() const noexcept { return only_ == nullptr && contest_.empty(); }
+    [[nodiscard]] bool isEmpty() const noexcept { return only_ == nullptr && root_->contest.empty(); }
     // Whether several shares want time.
     [[nodiscard]] bool isContested() const;
     // The share that comes next; not if none wants time.
@@ -47,19 +61,16 @@ public:
     void charge(Duration time, bool wantsMore);
 
 private:
-    // Those that want time, by the time that they used. Who is being served stays at the front: all others come in
-    // behind.
-    template <typename Each> using Contest = std::multimap<Duration, std::shared_ptr<Each>>;
+    using GroupKey = std::pair<std::uint32_t, std::optional<std::int32_t>>; // a user, or one of its processes
 
-    template <typename Each> static void enter(Contest<Each>& contest, const std::shared_ptr<Each>& each, Duration now);
-    template <typename Each> static void chargeFirst(Contest<Each>& contest, Duration time, bool wantsMore);
+    [[nodiscard]] std::shared_ptr<Node> groupOf(const GroupKey& key, const std::shared_ptr<Node>& in);
+    void compete(const std::shared_ptr<Node>& node);
+    void moveFirst(Node& group, bool wantsMore);
 
-    void compete(const std::shared_ptr<Share>& share);
-
-    std::map<std::uint32_t, std::weak_ptr<User>> users_;
+    const std::shared_ptr<Node> root_ = std::make_shared<Node>(); // its members are the users
+    std::map<GroupKey, std::weak_ptr<Node>> groups_;
+    std::size_t mostGroups_ = 0; // then those without shares are removed
     std::shared_ptr<Share> only_; // the one that wants time, if there is no other: then nothing has to be sorted
-    Contest<User> contest_; // otherwise
-    Duration now_{}; // what the user that was served last had used before
 };
 
 } // namespace platform

@@ -16,7 +16,7 @@
 namespace platform {
 
 namespace {
-constexpr std::uint32_t theService = ~0U; // no user has this number
+constexpr Submitter theService{.user = ~0U, .process = 0}; // no user has this number
 constexpr int partIfContested = 4; // of the longest turn
 } // namespace
 
@@ -29,10 +29,10 @@ public:
     {
     }
 
-    [[nodiscard]] std::shared_ptr<FairOrder::Lane> makeLane(std::uint32_t user)
+    [[nodiscard]] std::shared_ptr<FairOrder::Lane> makeLane(const Submitter& submitter)
     {
         const foundation::Lock lock(lock_);
-        return order_.makeLane(user);
+        return order_.makeLane(submitter);
     }
 
     [[nodiscard]] bool isFull(FairOrder::Lane& lane, std::size_t heldBytes)
@@ -307,7 +307,11 @@ thread_local SerialQueue::Work::ThisThread SerialQueue::Work::thisThread;
 // Items that run on the queue in turns with those of its other lanes.
 class SerialQueue::QueueLane final : public Lane {
 public:
-    QueueLane(std::shared_ptr<Work> work, std::uint32_t user) : work_(std::move(work)), lane_(work_->makeLane(user)) { }
+    QueueLane(std::shared_ptr<Work> work, const Submitter& submitter)
+        : work_(std::move(work)),
+          lane_(work_->makeLane(submitter))
+    {
+    }
 
     void submit(WorkItem item) override
     {
@@ -320,9 +324,9 @@ public:
         work_->add(lane_, std::move(item), mayTakeLong);
     }
     [[nodiscard]] bool isCurrent() const override { return work_->isCurrent(); }
-    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user) override
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(const Submitter& submitter) override
     {
-        return std::make_shared<QueueLane>(work_, user);
+        return std::make_shared<QueueLane>(work_, submitter);
     }
     [[nodiscard]] bool isFull(std::size_t heldBytes) override { return work_->isFull(*lane_, heldBytes); }
     void setReleaseHandler(std::function<void(std::size_t bytes)> handler) override
@@ -378,9 +382,9 @@ void SerialQueue::submitLong(TurnItem item)
     lane_->submitLong(std::move(item));
 }
 
-std::shared_ptr<Lane> SerialQueue::makeLane(std::uint32_t user)
+std::shared_ptr<Lane> SerialQueue::makeLane(const Submitter& submitter)
 {
-    return lane_->makeLane(user);
+    return lane_->makeLane(submitter);
 }
 
 bool SerialQueue::isCurrent() const

@@ -57,7 +57,7 @@ public:
     void submit(WorkItem item) override;
     void submit(TurnItem item) override;
     void submitLong(TurnItem item) override;
-    [[nodiscard]] std::shared_ptr<Lane> makeLane(std::uint32_t user) override;
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(const Submitter& submitter) override;
     [[nodiscard]] bool isCurrent() const override;
 
     // Returns when no item waits and no turn runs. Not for the queue's items and helpers.

@@ -214,7 +214,7 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheLaneIsFullAndNoPauseIsCounted)
     const auto queue = queues.makeTurnQueue("server", {});
     const auto mayRun = queues.makeSemaphore(0);
     queue->submit([&] { mayRun->wait(); });
-    const auto lane = queue->makeLane(0);
+    const auto lane = queue->makeLane({});
     beforeResuming = [&, isFirst = true](Connection& connection) mutable {
         if (std::exchange(isFirst, false))
             connection.setLane(lane, ledger.workloads().open(connection.userIdentifier()));

@@ -28,7 +28,7 @@ protected:
         queue = queues.makeTurnQueue("server", {});
         queue->submit([this] { mayRun->wait(); });
         beforeResuming = [this](Connection& connection) {
-            const auto lane = queue->makeLane(connection.userIdentifier());
+            const auto lane = queue->makeLane({connection.userIdentifier(), connection.processIdentifier()});
             progress.change([&] { lanes.push_back(lane); });
             connection.setLane(lane, ledger.workloads().open(connection.userIdentifier()));
         };

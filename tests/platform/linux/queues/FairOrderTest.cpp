@@ -13,8 +13,9 @@ using testing::ElementsAre;
 using testing::IsEmpty;
 using testing::SizeIs;
 
-constexpr std::uint32_t alice = 1000;
-constexpr std::uint32_t bob = 1001;
+constexpr Submitter alice{.user = 1000, .process = 1};
+constexpr Submitter alicesOther{.user = 1000, .process = 2}; // another process of hers
+constexpr Submitter bob{.user = 1001, .process = 3};
 
 class FairOrderTest : public testing::Test {
 protected:
@@ -96,6 +97,38 @@ TEST_F(FairOrderTest, AUserWithManyLanesGetsNoMoreThanOneWithASingleLane)
     const Lane single = order.makeLane(bob);
     addMany(single, "bob", 10);
     EXPECT_THAT(serveTimes(6, 1ms), ElementsAre("alice", "bob", "alice", "bob", "alice", "bob"));
+}
+
+TEST_F(FairOrderTest, AProcessWithManyLanesGetsNoMoreThanOneWithASingleLane)
+{
+    std::vector<Lane> many;
+    for (int index = 0; index < 10; ++index)
+        addMany(many.emplace_back(order.makeLane(alice)), "many", 10);
+    const Lane single = order.makeLane(alicesOther);
+    addMany(single, "single", 10);
+    EXPECT_THAT(serveTimes(6, 1ms), ElementsAre("many", "single", "many", "single", "many", "single"));
+}
+
+TEST_F(FairOrderTest, ProcessesOfOneUserGetTogetherNoMoreThanAnotherUser)
+{
+    const Lane one = order.makeLane(alice);
+    const Lane other = order.makeLane(alicesOther);
+    const Lane bobs = order.makeLane(bob);
+    for (const auto& [lane, name] : {std::pair(one, "one"), std::pair(other, "other"), std::pair(bobs, "bob")})
+        addMany(lane, name, 10);
+    EXPECT_THAT(serveTimes(8, 1ms), ElementsAre("one", "bob", "other", "bob", "one", "bob", "other", "bob"));
+}
+
+// Each is new and has used nothing yet.
+TEST_F(FairOrderTest, ALaneDoesNotWaitForTheManyThatAnotherProcessOpensOneAfterTheOther)
+{
+    const Lane single = order.makeLane(alicesOther);
+    add(single, "single");
+    serve(1ms);
+    for (int index = 0; index < 1000; ++index)
+        add(order.makeLane(alice), "new");
+    addMany(single, "single", 2);
+    EXPECT_THAT(serveTimes(4, 1ms), ElementsAre("new", "single", "new", "single"));
 }
 
 TEST_F(FairOrderTest, OneWhoComesLateWaitsOnlyForWhoIsBeingServed)
@@ -289,7 +322,7 @@ TEST_F(FairOrderTest, ReleasesWhatItemsHoldWhenAllThatCameTogetherHaveRun)
 TEST_F(FairOrderTest, CountsTheTimeOfALaneInItsWorkload)
 {
     ledger::Workloads workloads;
-    const auto workload = workloads.open(alice);
+    const auto workload = workloads.open(alice.user);
     const Lane lane = order.makeLane(alice);
     const Lane other = order.makeLane(bob);
     FairOrder::setWorkload(*lane, workload);

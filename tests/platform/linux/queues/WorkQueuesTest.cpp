@@ -385,13 +385,13 @@ protected:
     const std::unique_ptr<Semaphore> mayGo = queues.makeSemaphore(0);
     std::vector<std::string> ran;
     std::shared_ptr<TurnQueue> queue = queues.makeTurnQueue("com.quarn.kesto.test", {.mayBeHelped = true});
-    const std::shared_ptr<Lane> holder = queue->makeLane(0);
+    const std::shared_ptr<Lane> holder = queue->makeLane({});
 };
 
 TEST_F(LanesTest, AnItemDoesNotWaitForTheManyOfAnotherLane)
 {
-    const auto flood = queue->makeLane(1000);
-    const auto other = queue->makeLane(1000);
+    const auto flood = queue->makeLane({1000, 1});
+    const auto other = queue->makeLane({1000, 1});
     hold();
     for (int item = 0; item < 100; ++item)
         submit(*flood, "flood", 1ms);
@@ -405,10 +405,10 @@ TEST_F(LanesTest, AnItemDoesNotWaitForTheManyOfAnotherLane)
 TEST_F(LanesTest, AUserDoesNotWaitForTheManyLanesOfAnother)
 {
     std::vector<std::shared_ptr<Lane>> flood;
-    const auto other = queue->makeLane(1001);
+    const auto other = queue->makeLane({1001, 1});
     hold();
     for (int lane = 0; lane < 20; ++lane) {
-        flood.push_back(queue->makeLane(1000));
+        flood.push_back(queue->makeLane({1000, 1}));
         for (int item = 0; item < 5; ++item)
             submit(*flood.back(), "flood", 1ms);
     }
@@ -421,7 +421,7 @@ TEST_F(LanesTest, AUserDoesNotWaitForTheManyLanesOfAnother)
 
 TEST_F(LanesTest, TheQueueItselfIsALaneOfItsOwnUser)
 {
-    const auto flood = queue->makeLane(1000);
+    const auto flood = queue->makeLane({1000, 1});
     hold();
     for (int item = 0; item < 100; ++item)
         submit(*flood, "flood", 1ms);
@@ -433,7 +433,7 @@ TEST_F(LanesTest, TheQueueItselfIsALaneOfItsOwnUser)
 
 TEST_F(LanesTest, AnItemOfALaneIsCurrentOnItsQueue)
 {
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     bool isCurrent = false;
     lane->submit([&] { isCurrent = queue->isCurrent() && lane->isCurrent(); });
     drain(*lane);
@@ -445,8 +445,8 @@ TEST_F(LanesTest, TheTimeThatItsItemsTakeCountsInALanesWorkload)
     ledger::Workloads workloads;
     const auto busy = workloads.open(1000);
     const auto idle = workloads.open(1000);
-    const auto lane = queue->makeLane(1000);
-    const auto other = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
+    const auto other = queue->makeLane({1000, 1});
     lane->setWorkload(busy);
     other->setWorkload(idle);
     const auto begin = std::chrono::steady_clock::now();
@@ -461,8 +461,8 @@ TEST_F(LanesTest, TheTimeThatItsItemsTakeCountsInALanesWorkload)
 TEST_F(LanesTest, ItsItemsWriteToTheLogForTheirLanesShare)
 {
     const auto share = std::make_shared<LogShare>("client 7");
-    const auto lane = queue->makeLane(1000);
-    const auto other = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
+    const auto other = queue->makeLane({1000, 1});
     lane->setLogShare(share);
     LogShare* ofLane = nullptr;
     LogShare* ofOther = share.get();
@@ -475,7 +475,7 @@ TEST_F(LanesTest, ItsItemsWriteToTheLogForTheirLanesShare)
 
 TEST_F(LanesTest, AFullLaneSaysOnceWhenItHasRoomAgain)
 {
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     std::atomic<int> calls = 0;
     lane->setRoomHandler([&] { ++calls; });
     hold();
@@ -494,7 +494,7 @@ TEST_F(LanesTest, AFullLaneSaysOnceWhenItHasRoomAgain)
 TEST_F(LanesTest, AQueueThatEndsWaitsForLanesThatPause)
 {
     const auto elsewhere = queues.makeSerialQueue("com.quarn.kesto.test", {});
-    const auto lane = queue->makeLane(1000);
+    const auto lane = queue->makeLane({1000, 1});
     lane->submitLong([&](Turn&) {
         begun->signal();
         elsewhere->submit([this, resume = lane->pause()]() mutable {
@@ -512,8 +512,8 @@ TEST_F(LanesTest, AQueueThatEndsWaitsForLanesThatPause)
 
 TEST_F(LanesTest, AHelperServesLanesInTheSameOrder)
 {
-    const auto flood = queue->makeLane(1000);
-    const auto other = queue->makeLane(1001);
+    const auto flood = queue->makeLane({1000, 1});
+    const auto other = queue->makeLane({1001, 1});
     hold();
     for (int item = 0; item < 10; ++item)
         submit(*flood, "flood", 1ms);
