@@ -25,7 +25,9 @@ std::string durationText(double seconds)
         return fmt::format("{:.0f} s", seconds);
     if (seconds < secondsAnHour - secondsAMinute / 2)
         return fmt::format("{:.0f} min", seconds / secondsAMinute);
-    return fmt::format("{:.1f} h", seconds / secondsAnHour);
+    constexpr double manyHours = 1000;
+    const double hours = seconds / secondsAnHour;
+    return hours < manyHours ? fmt::format("{:.1f} h", hours) : fmt::format("{:.0f} h", hours);
 }
 
 std::string percentText(double share)
@@ -39,12 +41,19 @@ std::string counted(std::size_t count, std::string_view thing)
     return fmt::format("{} {}{}", count, thing, count == 1 ? "" : "s");
 }
 
+// Nothing of so short a time that one fault would be hundreds an hour.
+std::string rateText(const Played& played)
+{
+    const auto rate = played.faultsAnHour();
+    return rate && played.seconds >= secondsAMinute ? fmt::format("{:.2f}", *rate) : std::string();
+}
+
 std::string keyText(std::string_view key)
 {
     return key.empty() ? "(unknown)" : printable(key);
 }
 
-// The longest text of the column sets its width.
+// A column is as wide as its longest text, and at least as wide as it was made.
 class Table {
 public:
     struct Column {
@@ -58,7 +67,12 @@ public:
     };
 
     Table(std::string_view head, std::vector<Column> columns) : head_(head), columns_(std::move(columns)) { }
-    void add(Row row) { rows_.push_back(std::move(row)); }
+    void add(Row row)
+    {
+        for (std::size_t index = 0; index < row.figures.size(); ++index)
+            columns_[index].width = std::max(columns_[index].width, columnsOf(row.figures[index]));
+        rows_.push_back(std::move(row));
+    }
 
     [[nodiscard]] std::string text(const ReportLayout& layout) const
     {
@@ -147,8 +161,8 @@ private:
         std::string text = fmt::format("{} {} in {}{}", durationText(report_.all.seconds), done(),
                                        counted(report_.all.sessions, "session"), dot);
         text += report_.all.faults == 0 ? "no faults" : counted(report_.all.faults, "fault");
-        if (const auto rate = report_.all.faultsAnHour(); rate && report_.all.faults != 0)
-            text += fmt::format(", {:.2f} an hour", *rate);
+        if (const std::string rate = rateText(report_.all); !rate.empty() && report_.all.faults != 0)
+            text += fmt::format(", {} an hour", rate);
         std::string ends = report_.vanished == 0 ? std::string() : fmt::format("{} vanished", report_.vanished);
         if (report_.running != 0)
             ends += fmt::format("{}{} still running", ends.empty() ? "" : ", ", report_.running);
@@ -205,11 +219,10 @@ private:
         for (std::size_t index = 0; index < all.size(); ++index) {
             const auto& [key, played] = all[index];
             const auto volume = played.meanVolume();
-            const auto rate = played.faultsAnHour();
             if (index < shown)
                 table.add({keyText(key),
                            {durationText(played.seconds), shareText(played.seconds), volume ? percentText(*volume) : "",
-                            fmt::format("{}", played.faults), rate ? fmt::format("{:.2f}", *rate) : ""},
+                            fmt::format("{}", played.faults), rateText(played)},
                            played.seconds});
             else
                 rest += played.seconds;

@@ -119,7 +119,7 @@ TEST_F(ReportCommand, CoversThisDayAndTheSixBeforeIt)
     const std::string csv = tool.print({"report", "--csv"});
     EXPECT_EQ(std::ranges::count(csv, '\n'), 8);
     EXPECT_THAT(tool.print({"report"}), StartsWith("30 s played in 1 session"));
-    EXPECT_THAT(tool.print({"report", "--since", "30d"}), StartsWith("60 s played in 1 session"));
+    EXPECT_THAT(tool.print({"report", "--since", "30d"}), StartsWith("1 min played in 1 session"));
 }
 
 TEST_F(ReportCommand, SaysWhatToDoWhereNothingWasPlayed)
@@ -179,6 +179,7 @@ TEST(ReportOfAService, CountsWhatRunsUpToNowAndWhatWasKilledUpToItsLastWord)
         further.insert(further.begin() + 2, kestod.directory() / "state/analytics.sqlite3");
         return tool.print(further);
     };
+    tool.setVariable("LC_ALL=C");
     WireClient client(kestod.socketPath());
     constexpr int session = 1;
     client.ask(WireMethod::Create, session);
@@ -195,10 +196,10 @@ TEST(ReportOfAService, CountsWhatRunsUpToNowAndWhatWasKilledUpToItsLastWord)
          {{"session_output_running", true}, {"active_devices", "null-sink"}, {"PomoSessionVolume", 0.5}});
     send(error, issueDetector, {{"issue", "late_cycles"}, {"late_cycles", 3}});
     EXPECT_THAT(print({}),
-                MatchesRegex("[0-9]+ s played in 1 session; 1 fault, [0-9.]+ an hour; 1 still running\n"
+                MatchesRegex("[0-9]+ s played in 1 session; 1 fault; 1 still running\n"
                              "DAY           PLAYED\n(.|\n)*"
                              "APPLICATION   PLAYED  SHARE  VOLUME  FAULTS  /HOUR\n"
-                             "tone-player .* s  100 %    50 %       1  [ 0-9.]+  #+\n"));
+                             "tone-player .* s  100 %    50 %       1         #+\n"));
     EXPECT_THAT(print({"--csv", "--by", "device"}), MatchesRegex("device,.*\nnull-sink,[0-9]+\\.[0-9]+,1,1,0.5\n"));
     kestod.kill();
     const std::string first = print({"--json"});

@@ -75,7 +75,7 @@ TEST(ReportAsText, HasTablesWithBars)
               "APPLICATION          PLAYED  SHARE  VOLUME  FAULTS  /HOUR\n"
               "org.example.player    8.0 h   80 %    38 %       2   0.25  █████████████████████\n"
               "a?[2Jb?c,?d           2.0 h   20 %               0   0.00  █████▎\n"
-              "(unknown)               2 s    0 %               0   0.00  ▏\n"
+              "(unknown)               2 s    0 %               0         ▏\n"
               "2.0 h of it muted, which no mean volume counts\n"
               "2 s of it by streams that told no volume\n"
               "streams at the same time each count: a day may have more than 24 h\n");
@@ -88,7 +88,7 @@ TEST(ReportAsText, HasEachTable)
                 StartsWith("DEVICE        PLAYED  SHARE  VOLUME  FAULTS  /HOUR\n"
                            "speaker        8.0 h   80 %    38 %       2   0.25  ########\n"
                            "dock,\"left\"    2.0 h   20 %               0   0.00  ##\n"
-                           "(unknown)        2 s    0 %               0   0.00  #\n"));
+                           "(unknown)        2 s    0 %               0         #\n"));
     EXPECT_THAT(textBy(ReportBy::Format, layout),
                 StartsWith("FORMAT          PLAYED  SHARE  VOLUME  FAULTS  /HOUR\n"
                            "S16LE/48000/2   10.0 h  100 %    38 %       2   0.20  ######\n"));
@@ -116,6 +116,39 @@ TEST(ReportAsText, IsCutToTheWidthOfTheTerminal)
     EXPECT_THAT(
         textBy(ReportBy::Application, {.width = std::string::npos, .isUTF8 = true}),
         HasSubstr("org.example.player    8.0 h   80 %    38 %       2   0.25  ██████████████████████████████\n"));
+}
+
+TEST(ReportAsText, MakesRoomForLongFigures)
+{
+    History history = historyForForms();
+    history.stretches.resize(1);
+    history.faults.resize(1);
+    history.faults.insert(history.faults.end(), 99'999, history.faults[0]);
+    history.stretches[0].seconds = 60;
+    EXPECT_EQ(reportText(reportForForms(history), {ReportBy::Application}, {.width = 60, .isUTF8 = false}),
+              "1 min played in 1 session; 100000 faults, 6000000.00 an hour\n"
+              "APPLICATION        PLAYED  SHARE  VOLUME  FAULTS       /HOUR\n"
+              "org.example.pla…    1 min  100 %    38 %  100000  6000000.00\n");
+}
+
+TEST(ReportAsText, HasShortTimesInShortUnits)
+{
+    const auto textOf = [](double seconds) {
+        History history = historyForForms();
+        history.stretches.resize(1);
+        history.stretches[0].seconds = seconds;
+        const std::string text = reportText(makeReport(history, {.from = dayBegins, .until = dayBegins + 9000 * hour},
+                                                       false, {.afterMidnight = {}, .isUTC = true}),
+                                            {}, {});
+        return text.substr(0, text.find(" played"));
+    };
+    EXPECT_EQ(textOf(0.4), "0 s");
+    EXPECT_EQ(textOf(59.4), "59 s");
+    EXPECT_EQ(textOf(59.6), "1 min");
+    EXPECT_EQ(textOf(3569), "59 min");
+    EXPECT_EQ(textOf(3571), "1.0 h");
+    EXPECT_EQ(textOf(999.9 * hour), "999.9 h");
+    EXPECT_EQ(textOf(8000 * hour), "8000 h");
 }
 
 TEST(ReportAsText, HasNoLineForWhatDoesNotApply)
