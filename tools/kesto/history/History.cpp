@@ -78,7 +78,9 @@ private:
     {
         const std::int64_t session = row.integer(0);
         const bool isAskedFor = (row.integer(1) != 0) == question_.isRecording;
-        (isAskedFor ? sessions_ : otherSessions_).push_back(session);
+        auto& sessions = isAskedFor ? sessions_ : otherSessions_;
+        if (sessions.empty() || sessions.back() != session)
+            sessions.push_back(session);
         if (!isAskedFor)
             return;
         history_.stretches.push_back({.session = session,
@@ -184,9 +186,11 @@ private:
     {
         std::ranges::sort(history_.stretches, {},
                           [](const PlayedStretch& stretch) { return std::pair(stretch.session, stretch.began); });
-        for (Fault& fault : history_.faults)
-            if (const auto* const stretch = stretchOf(history_, fault); fault.device.empty() && stretch != nullptr)
+        for (Fault& fault : history_.faults) {
+            const auto* const stretch = fault.device.empty() ? stretchOf(history_, fault) : nullptr;
+            if (stretch != nullptr)
                 fault.device = stretch->device;
+        }
         const auto isLeftOut = [this](const auto& each) {
             const HistorySession* const session = sessionOf(history_, each.session);
             return !matches(each.device, question_.devices)

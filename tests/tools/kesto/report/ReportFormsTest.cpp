@@ -251,6 +251,17 @@ TEST(ReportAsCsv, HasVolumesAndFaults)
     EXPECT_EQ(reportCsv(reportForForms(), ReportBy::Fault), "fault,faults,sessions\nIssueDetector,2,1\n");
 }
 
+TEST(ReportAsCsv, QuotesQuotes)
+{
+    History history = historyForForms();
+    history.stretches.resize(1);
+    history.stretches[0].device = "the \"left\" one";
+    EXPECT_EQ(reportCsv(reportForForms(history), ReportBy::Device),
+              "device,seconds,sessions,faults,mean_volume\n"
+              "\"the \"\"left\"\" one\",28800.0,1,0,0.375\n"
+              "speaker,0.0,0,2,\n");
+}
+
 TEST(DecimalText, HasAPointAndNoIdleZeros)
 {
     EXPECT_EQ(decimalText(0, 3), "0.0");
