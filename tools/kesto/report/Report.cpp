@@ -297,6 +297,7 @@ private:
     {
         constexpr double rounding = 0.001; // of stretches that follow one another
         std::vector<std::pair<double, double>> times;
+        times.reserve(pieces_.size());
         for (const CountedPiece& each : pieces_)
             times.emplace_back(each.piece.from, each.piece.until);
         std::ranges::sort(times);

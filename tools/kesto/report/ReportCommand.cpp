@@ -120,6 +120,7 @@ std::string textOf(const Report& report, const ReportOptions& options)
 std::vector<std::string> tableNames()
 {
     std::vector<std::string> names;
+    names.reserve(allTables.size());
     for (const ReportBy by : allTables)
         names.emplace_back(name(by));
     return names;

@@ -37,6 +37,7 @@ Dictionary withFigures(Dictionary::Entries entries, const Played& played)
 template <typename Rows, typename Make> Array listOf(const Rows& rows, Make make)
 {
     std::vector<Value> list;
+    list.reserve(rows.size());
     for (const auto& row : rows)
         list.emplace_back(make(row));
     return Array(std::move(list));

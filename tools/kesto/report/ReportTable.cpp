@@ -23,6 +23,7 @@ const std::vector<ReportLine>& linesOf(const Report& report, ReportBy by)
 std::vector<VolumeStep> volumeSteps(const Report& report)
 {
     std::vector<VolumeStep> steps;
+    steps.reserve(report.secondsAtVolume.size());
     for (const double seconds : report.secondsAtVolume)
         steps.push_back(
             {.upTo = static_cast<double>(steps.size() + 1) / double{Report::volumeSteps}, .seconds = seconds});

@@ -111,6 +111,7 @@ private:
     [[nodiscard]] std::vector<std::string> heads() const
     {
         std::vector<std::string> heads;
+        heads.reserve(columns_.size());
         for (const Column& column : columns_)
             heads.emplace_back(column.head);
         return heads;
