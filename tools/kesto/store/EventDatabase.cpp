@@ -61,8 +61,8 @@ void EventDatabase::open()
     const std::uint64_t file = fileNumber(path_);
     sqlite3* opened = nullptr;
     const std::string uri = uriOf(path_) + (isUnchanging_ ? "?immutable=1" : "");
-    const int status = sqlite3_open_v2(uri.c_str(), &opened,
-                                       SQLITE_OPEN_READONLY | SQLITE_OPEN_URI | SQLITE_OPEN_NOMUTEX, nullptr);
+    const int status =
+        sqlite3_open_v2(uri.c_str(), &opened, SQLITE_OPEN_READONLY | SQLITE_OPEN_URI | SQLITE_OPEN_NOMUTEX, nullptr);
     database_.reset(opened);
     if (status != SQLITE_OK)
         throw unreadable();
