@@ -27,6 +27,7 @@ int main(int argumentCount, char** arguments)
     addEventsCommand(application, exitStatus);
     addNotifyCommand(application, exitStatus);
     addPrefsCommand(application, exitStatus);
+    addReportCommand(application, exitStatus);
     addStatusCommand(application, exitStatus);
     addSummaryCommand(application, exitStatus);
     addTraceCommand(application, exitStatus);

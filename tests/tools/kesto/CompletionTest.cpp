@@ -46,13 +46,14 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
     EXPECT_THAT(completions("events --count \"\""), IsEmpty());
     EXPECT_THAT(completions("events --since 1"), UnorderedElementsAre("10m", "1h"));
     EXPECT_THAT(completions("notify com"), ElementsAre("com.quarn.halden.ringerstate"));
+    EXPECT_THAT(completions("report --by d"), UnorderedElementsAre("day", "device"));
     EXPECT_THAT(completions("unknown \"\""), IsEmpty());
 }
 
 TEST_F(Completion, NamesEveryOptionThatTheToolHas)
 {
-    for (const std::string verb : {"bugs", "channels", "client", "events", "status", "summary", "notify", "trace",
-                                   "trace record", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
+    for (const std::string verb : {"bugs", "channels", "client", "events", "report", "status", "summary", "notify",
+                                   "trace", "trace record", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
         std::istringstream help(tool.runShell("$kesto " + verb + " --help").output);
         const auto offered = completions(verb + " --");
         for (std::string word; help >> word;)

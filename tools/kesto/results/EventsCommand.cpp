@@ -38,9 +38,8 @@ public:
 
     void print(const StoredEvent& event) const
     {
-        constexpr std::string_view prefix = "com.quarn.";
-        const std::string_view name = event.name.starts_with(prefix)
-            ? std::string_view(event.name).substr(prefix.size())
+        const std::string_view name = event.name.starts_with(namePrefix)
+            ? std::string_view(event.name).substr(namePrefix.size())
             : std::string_view(event.name);
         std::string application;
         const std::string payload = describe(event.payload, application);
@@ -110,12 +109,20 @@ public:
         else
             print();
         if (!options_.isFollowing)
-            return;
+            return explainNothing();
         filter_.mostRecent.reset();
         follow();
     }
 
 private:
+    // A pattern that is wrong looks like a store that is empty.
+    void explainNothing() const
+    {
+        if (filter_.afterID == 0 && filter_.namePattern != "*")
+            fmt::print(stderr, "kesto: no event{} has a name that matches '{}'\n",
+                       options_.since.empty() ? "" : " of that time", printable(filter_.namePattern));
+    }
+
     // Treats all present events as seen.
     void passOver()
     {
@@ -173,7 +180,7 @@ void addEventsCommand(CLI::App& application, int& exitStatus)
     CLI::App* command = application.add_subcommand("events", "Lists the stored events, the most recent last");
     command->add_option("--database", options->database, "The event store, if it is not at its usual place");
     command->add_option("--name", options->filter.namePattern,
-                        "Only events with matching names, such as 'com.quarn.*.Volume.*'");
+                        "Only events with matching names, such as '*.Volume.*' or kesto.Playback.Start");
     command->add_option("--since", options->since,
                         "Only events since then: 90s, 10m, 2h, 7d ago, or a time such as 2026-01-31T18:00:00");
     command->add_option("--count", options->filter.mostRecent, "At most this many, the most recent ones")

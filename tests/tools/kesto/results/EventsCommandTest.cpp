@@ -161,7 +161,35 @@ TEST_F(EventsCommand, FiltersByName)
     EXPECT_EQ(printJson({"--name", "com.a.*"}), jsonLine(1, "com.a.Start") + jsonLine(3, "com.a.Stop"));
     EXPECT_EQ(printJson({"--name", "com.?.Start"}), jsonLine(1, "com.a.Start") + jsonLine(2, "com.b.Start"));
     EXPECT_EQ(printJson({"--name", "com.'a"}), jsonLine(4, "com.'a"));
-    EXPECT_EQ(printJson({"--name", "com"}), "");
+}
+
+TEST_F(EventsCommand, FiltersByNameWithoutTheirPrefix)
+{
+    const auto database = makeStore(
+        {"com.quarn.kesto.Playback.Start", "kesto.Playback.Start", "com.quarn.kesto.Playback.Stop", "x.kesto"});
+    EXPECT_EQ(printJson({"--name", "kesto.Playback.Start"}),
+              jsonLine(1, "com.quarn.kesto.Playback.Start") + jsonLine(2, "kesto.Playback.Start"));
+    EXPECT_EQ(printJson({"--name", "kesto.*"}),
+              jsonLine(1, "com.quarn.kesto.Playback.Start") + jsonLine(2, "kesto.Playback.Start")
+                  + jsonLine(3, "com.quarn.kesto.Playback.Stop"));
+    EXPECT_EQ(printJson({"--name", "com.quarn.kesto.*.Start"}), jsonLine(1, "com.quarn.kesto.Playback.Start"));
+}
+
+TEST_F(EventsCommand, SaysThatNoNameMatches)
+{
+    const auto database = makeStore({"com.a.Start"});
+    const auto expectNothing = [this](const Tool::Arguments& arguments, const std::string& errors) {
+        const Finished finished = tool.run(arguments);
+        EXPECT_EQ(finished.status, 0);
+        EXPECT_EQ(finished.output, "");
+        EXPECT_EQ(finished.errors, errors);
+    };
+    expectNothing({"events", "--json", "--name", "com"}, "kesto: no event has a name that matches 'com'\n");
+    expectNothing({"events", "--json", "--name", "com.a.*", "--since", "2026-01-31"},
+                  "kesto: no event of that time has a name that matches 'com.a.*'\n");
+    expectNothing({"events", "--json", "--name", "a\x1B[2J"}, "kesto: no event has a name that matches 'a?[2J'\n");
+    expectNothing({"events", "--json", "--since", "2026-01-31"}, "");
+    expectNothing({"events", "--json", "--name", "com.a.*", "--count", "0"}, "");
 }
 
 TEST_F(EventsCommand, FiltersByTime)
