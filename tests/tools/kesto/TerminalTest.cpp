@@ -1,5 +1,6 @@
 // The text for a terminal, and its width.
 #include "kesto/Terminal.h"
+#include "support/EnvironmentVariable.h"
 
 #include <gtest/gtest.h>
 
@@ -46,6 +47,32 @@ TEST(ColumnsBehind, LeavesSomethingOfANarrowTerminal)
     EXPECT_EQ(columnsBehind(60, 61), 8U);
     EXPECT_EQ(columnsBehind(60, 10), 8U);
     EXPECT_EQ(columnsBehind(60, std::string::npos), std::string::npos);
+}
+
+TEST(AsciiText, KeepsTheColumns)
+{
+    EXPECT_EQ(asciiText("plain"), "plain");
+    EXPECT_EQ(asciiText("Küche ☕…"), "K?che ?~");
+    EXPECT_EQ(asciiText("\x9B"
+                        "31m"),
+              "31m"); // no character at all
+}
+
+TEST(ShowsUTF8, GoesByTheEnvironment)
+{
+    const support::EnvironmentVariable all("LC_ALL", "C.UTF-8");
+    EXPECT_TRUE(showsUTF8());
+    const support::EnvironmentVariable none("LC_ALL", "C");
+    EXPECT_FALSE(showsUTF8());
+    const support::EnvironmentVariable unknown("LC_ALL", "no_SUCH.UTF-8");
+    EXPECT_FALSE(showsUTF8());
+}
+
+TEST(SizeText, HasAUnit)
+{
+    EXPECT_EQ(sizeText(999), "999 B");
+    EXPECT_EQ(sizeText(4'000), "4 kB");
+    EXPECT_EQ(sizeText(35'249'999), "35.2 MB");
 }
 
 TEST(ShownText, IsTextAsItIsAndElseJson)
