@@ -10,6 +10,7 @@ void measureRoundTrip(const BenchOptions& options, Report& report);
 void measurePipeline(const BenchOptions& options, Report& report);
 void measureStored(const BenchOptions& options, Report& report);
 void measureStoredQueries(const BenchOptions& options, Report& report);
+void measureReports(const BenchOptions& options, Report& report);
 void measureGrowingSession(const BenchOptions& options, Report& report);
 void measureSessionEnd(const BenchOptions& options, Report& report);
 void measureEndedSessions(const BenchOptions& options, Report& report);

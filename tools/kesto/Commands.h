@@ -20,6 +20,7 @@ void addClientCommand(CLI::App& application, int& exitStatus);
 void addEventsCommand(CLI::App& application, int& exitStatus);
 void addNotifyCommand(CLI::App& application, int& exitStatus);
 void addPrefsCommand(CLI::App& application, int& exitStatus);
+void addReportCommand(CLI::App& application, int& exitStatus);
 void addSessionsCommand(CLI::App& application, int& exitStatus);
 void addStatusCommand(CLI::App& application, int& exitStatus);
 void addSummaryCommand(CLI::App& application, int& exitStatus);

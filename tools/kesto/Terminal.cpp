@@ -5,10 +5,11 @@
 #include "platform/linux/process/Environment.h"
 
 #include <algorithm>
+#include <array>
+#include <cctype>
+#include <cmath>
 #include <cstdlib>
 #include <fmt/format.h>
-#include <langinfo.h>
-#include <locale.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
@@ -22,9 +23,25 @@ bool isFirstByte(char byte)
     return (static_cast<unsigned char>(byte) & 0xC0U) != 0x80U;
 }
 
-std::size_t columnsOf(std::string_view text)
+// How many bytes the control character at the beginning of the text has; 0 if there is none. Others than those of ASCII
+// have two or three bytes in UTF-8.
+std::size_t controlBytes(std::string_view text)
 {
-    return static_cast<std::size_t>(std::ranges::count_if(text, isFirstByte));
+    const auto byteAt = [text](std::size_t index) {
+        return index < text.size() ? static_cast<unsigned char>(text[index]) : 0U;
+    };
+    const auto isWithin = [](unsigned byte, unsigned first, unsigned last) { return byte >= first && byte <= last; };
+    const unsigned first = byteAt(0);
+    const unsigned second = byteAt(1);
+    const unsigned third = byteAt(2);
+    if (first < 0x20 || first == 0x7F)
+        return 1;
+    if ((first == 0xC2 && isWithin(second, 0x80, 0x9F)) || (first == 0xD8 && second == 0x9C))
+        return 2; // U+0080 to U+009F; U+061C
+    const bool isMarkOrEmbedding = second == 0x80 && (isWithin(third, 0x8E, 0x8F) || isWithin(third, 0xAA, 0xAE));
+    const bool isIsolate = second == 0x81 && isWithin(third, 0xA6, 0xA9);
+    return first == 0xE2 && (isMarkOrEmbedding || isIsolate) ? 3
+                                                             : 0; // U+200E, U+200F, U+202A to U+202E; U+2066 to U+2069
 }
 
 // Zeros if standard output is no terminal, or one that does not tell.
@@ -40,14 +57,17 @@ std::string printable(std::string_view text)
 {
     std::string shown;
     shown.reserve(text.size());
-    for (std::size_t index = 0; index < text.size(); ++index) {
-        const auto byte = static_cast<unsigned char>(text[index]);
-        const auto next = index + 1 < text.size() ? static_cast<unsigned char>(text[index + 1]) : 0U;
-        const bool isHighControl = byte == 0xC2 && next >= 0x80 && next < 0xA0;
-        shown += byte < 0x20 || byte == 0x7F || isHighControl ? '?' : text[index];
-        index += isHighControl ? 1 : 0;
+    while (!text.empty()) {
+        const std::size_t bytes = controlBytes(text);
+        shown += bytes == 0 ? text.front() : '?';
+        text.remove_prefix(std::max<std::size_t>(bytes, 1));
     }
     return shown;
+}
+
+std::size_t columnsOf(std::string_view text)
+{
+    return static_cast<std::size_t>(std::ranges::count_if(text, isFirstByte));
 }
 
 std::string fitted(std::string_view text, std::size_t columns)
@@ -65,6 +85,12 @@ std::string padded(std::string text, std::size_t columns)
     return std::move(text) + std::string(columns > width ? columns - width : 0, ' ');
 }
 
+std::string alignedRight(std::string_view text, std::size_t columns)
+{
+    const std::size_t width = columnsOf(text);
+    return std::string(columns > width ? columns - width : 0, ' ').append(text);
+}
+
 std::size_t outputWidth()
 {
     if (const winsize size = outputSize(); size.ws_col > 0)
@@ -80,22 +106,39 @@ std::size_t outputHeight()
     return size.ws_row > 0 ? size.ws_row : std::string::npos;
 }
 
+bool showsUTF8()
+{
+    for (const char* name : {"LC_ALL", "LC_CTYPE", "LANG"}) {
+        std::string locale = platform::environment(name);
+        std::ranges::transform(locale, locale.begin(), [](unsigned char letter) { return std::tolower(letter); });
+        if (!locale.empty())
+            return locale.contains("utf-8") || locale.contains("utf8");
+    }
+    return false;
+}
+
+std::string bar(double share, std::size_t columns, bool isUTF8)
+{
+    if (!(share > 0))
+        return {};
+    constexpr std::array<std::string_view, 8> eighths{"", "▏", "▎", "▍", "▌", "▋", "▊", "▉"};
+    const double steps = isUTF8 ? eighths.size() : 1;
+    const double most = static_cast<double>(columns) * steps;
+    const auto length = static_cast<std::size_t>(std::clamp(std::round(share * most), 1.0, most));
+    if (!isUTF8)
+        return std::string(length, '#');
+    std::string text;
+    for (std::size_t full = 0; full < length / eighths.size(); ++full)
+        text += "█";
+    return text.append(eighths[length % eighths.size()]);
+}
+
 std::size_t columnsBehind(std::size_t used, std::size_t width)
 {
     constexpr std::size_t least = 8;
     if (width == std::string::npos)
         return width;
     return width > used + least ? width - used : least;
-}
-
-bool showsUTF8()
-{
-    const locale_t locale = ::newlocale(LC_CTYPE_MASK, "", nullptr);
-    if (locale == nullptr)
-        return false;
-    const bool isUTF8 = std::string_view(::nl_langinfo_l(CODESET, locale)) == "UTF-8";
-    ::freelocale(locale);
-    return isUTF8;
 }
 
 std::string asciiText(std::string_view text)

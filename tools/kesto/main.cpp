@@ -42,6 +42,7 @@ int main(int argumentCount, char** arguments)
     addEventsCommand(application, exitStatus);
     addNotifyCommand(application, exitStatus);
     addPrefsCommand(application, exitStatus);
+    addReportCommand(application, exitStatus);
     addSessionsCommand(application, exitStatus);
     addStatusCommand(application, exitStatus);
     addSummaryCommand(application, exitStatus);

@@ -49,13 +49,14 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
     EXPECT_THAT(completions("sessions --sort p"), ElementsAre("played"));
     EXPECT_THAT(completions("top --delay \"\""), IsEmpty());
     EXPECT_THAT(completions("notify com"), ElementsAre("com.quarn.halden.ringerstate"));
+    EXPECT_THAT(completions("report --by d"), UnorderedElementsAre("day", "device"));
     EXPECT_THAT(completions("unknown \"\""), IsEmpty());
 }
 
 TEST_F(Completion, NamesEveryOptionThatTheToolHas)
 {
     for (const std::string verb :
-         {"bugs", "channels", "client", "events", "sessions", "status", "summary", "notify", "top", "trace",
+         {"bugs", "channels", "client", "events", "report", "sessions", "status", "summary", "notify", "top", "trace",
           "trace record", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
         std::istringstream help(tool.runShell("$kesto " + verb + " --help").output);
         const auto offered = completions(verb + " --");

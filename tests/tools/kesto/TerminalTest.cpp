@@ -2,6 +2,8 @@
 #include "kesto/Terminal.h"
 #include "support/EnvironmentVariable.h"
 
+#include <cmath>
+#include <cstdlib>
 #include <gtest/gtest.h>
 
 namespace {
@@ -23,6 +25,64 @@ TEST(Printable, ReplacesWhatMovesTheCursorOrChangesColours)
                         "a \xC2"),
               "cut \xC2"
               "a \xC2"); // parts of characters; terminals can show them
+}
+
+TEST(Printable, ReplacesWhatChangesTheDirectionOfText)
+{
+    EXPECT_EQ(printable("a\u202Ab\u202Bc\u202Cd\u202De\u202Ef"), "a?b?c?d?e?f");
+    EXPECT_EQ(printable("a\u2066b\u2067c\u2068d\u2069e"), "a?b?c?d?e");
+    EXPECT_EQ(printable("\u200E\u200F\u061C"), "???");
+    EXPECT_EQ(printable("\u200D\u2010\u2029\u202F\u2065\u206A\u061B\u061D"),
+              "\u200D\u2010\u2029\u202F\u2065\u206A\u061B\u061D");
+    EXPECT_EQ(printable("cut \xE2\x80"), "cut \xE2\x80");
+}
+
+TEST(AlignedRight, CountsCharacters)
+{
+    EXPECT_EQ(alignedRight("äö", 4), "  äö");
+    EXPECT_EQ(alignedRight("abcde", 4), "abcde");
+}
+
+TEST(Bar, HasEighthsOfAColumn)
+{
+    EXPECT_EQ(bar(1, 4, true), "████");
+    EXPECT_EQ(bar(0.5, 4, true), "██");
+    EXPECT_EQ(bar(0.5, 1, true), "▌");
+    EXPECT_EQ(bar(0.46, 4, true), "█▉");
+    EXPECT_EQ(bar(0.0001, 4, true), "▏");
+    EXPECT_EQ(bar(0, 4, true), "");
+    EXPECT_EQ(bar(7, 4, true), "████");
+    EXPECT_EQ(bar(std::nan(""), 4, true), "");
+}
+
+TEST(Bar, IsOfAsciiWhereTheTerminalHasNoOther)
+{
+    EXPECT_EQ(bar(1, 4, false), "####");
+    EXPECT_EQ(bar(0.6, 4, false), "##");
+    EXPECT_EQ(bar(0.0001, 4, false), "#");
+    EXPECT_EQ(bar(0, 4, false), "");
+}
+
+class ShowsUTF8 : public testing::Test {
+protected:
+    void SetUp() override { TearDown(); }
+    void TearDown() override
+    {
+        for (const char* name : {"LC_ALL", "LC_CTYPE", "LANG"})
+            ::unsetenv(name);
+    }
+};
+
+TEST_F(ShowsUTF8, IsSaidByTheFirstVariableThatIsSet)
+{
+    EXPECT_FALSE(showsUTF8());
+    ::setenv("LANG", "de_DE.UTF-8", 1);
+    EXPECT_TRUE(showsUTF8());
+    ::setenv("LC_CTYPE", "C.utf8", 1);
+    ::setenv("LANG", "C", 1);
+    EXPECT_TRUE(showsUTF8());
+    ::setenv("LC_ALL", "POSIX", 1);
+    EXPECT_FALSE(showsUTF8());
 }
 
 TEST(Fitted, CutsBetweenCharacters)
@@ -56,16 +116,6 @@ TEST(AsciiText, KeepsTheColumns)
     EXPECT_EQ(asciiText("\x9B"
                         "31m"),
               "31m"); // no character at all
-}
-
-TEST(ShowsUTF8, GoesByTheEnvironment)
-{
-    const support::EnvironmentVariable all("LC_ALL", "C.UTF-8");
-    EXPECT_TRUE(showsUTF8());
-    const support::EnvironmentVariable none("LC_ALL", "C");
-    EXPECT_FALSE(showsUTF8());
-    const support::EnvironmentVariable unknown("LC_ALL", "no_SUCH.UTF-8");
-    EXPECT_FALSE(showsUTF8());
 }
 
 TEST(SizeText, HasAUnit)

@@ -40,8 +40,8 @@ struct ReportDay {
     std::chrono::year_month_day date;
     TimeSpan span; // cut at the ends of the report
     Played played;
-    std::vector<double> byApplication; // seconds, in the order of `Report::applications`
-    std::vector<Played> byDevice; // in the order of `Report::devices`
+    std::vector<double> byApplication; // seconds, of the first `Report::mostInDays` of `Report::applications`
+    std::vector<Played> byDevice; // of the first so many of `Report::devices`
 };
 
 // A session with faults.
@@ -59,6 +59,7 @@ struct WorstSession {
 struct Report {
     static constexpr std::size_t volumeSteps = 16; // of the slider
     static constexpr std::size_t mostWorst = 10;
+    static constexpr std::size_t mostInDays = 64; // clients choose how many applications and devices there are
 
     TimeSpan span;
     bool isRecording = false;

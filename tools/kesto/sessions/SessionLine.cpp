@@ -51,13 +51,6 @@ void addTo(Played& played, const PlayedStretch& stretch)
         played.loudness += stretch.seconds * *stretch.volume;
 }
 
-std::optional<double> meanVolume(const Played& played)
-{
-    constexpr double least = 1e-6; // what is left of nothing by rounding
-    const double heard = played.seconds - played.mutedSeconds - played.unheardSeconds;
-    return heard > least ? std::optional(played.loudness / heard) : std::nullopt;
-}
-
 std::string_view name(SessionEnd end)
 {
     switch (end) {

@@ -6,7 +6,6 @@
 
 #include <cstddef>
 #include <cstdint>
-#include <optional>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -28,8 +27,6 @@ struct SessionLine {
 
 // As `Played` sums up.
 void addTo(Played& played, const PlayedStretch& stretch);
-// By time; of what was neither muted nor without a volume. None if there was no such time.
-[[nodiscard]] std::optional<double> meanVolume(const Played& played);
 
 enum class SessionOrder : std::uint8_t { Began, Played, Faults };
 

@@ -6,6 +6,7 @@
 #include "foundation/values/Json.h"
 #include "foundation/values/Value.h"
 #include "kesto/Terminal.h"
+#include "kesto/report/ReportCsv.h"
 
 #include <algorithm>
 #include <chrono>
@@ -40,17 +41,6 @@ std::string utcText(double seconds)
     return fmt::format("{:%Y-%m-%dT%H:%M:%S}.{:03}Z", second, milliseconds % millisecondsASecond);
 }
 
-std::string csvField(std::string_view text)
-{
-    const std::string shown = printable(text);
-    if (shown.find_first_of(",\"") == std::string::npos)
-        return shown;
-    std::string quoted = "\"";
-    for (const char character : shown)
-        quoted.append(character == '"' ? 2 : 1, character);
-    return quoted + '"';
-}
-
 template <typename Number> Value valueOf(const std::optional<Number>& number)
 {
     return number ? Value(*number) : Value();
@@ -76,7 +66,7 @@ Dictionary::Entries entries(const SessionLine& line)
             {"muted_seconds", played.mutedSeconds},
             {"no_volume_seconds", played.unheardSeconds},
             {"device", known(devices)},
-            {"mean_volume", valueOf(meanVolume(played))},
+            {"mean_volume", valueOf(played.meanVolume())},
             {"faults", played.faults},
             {"end", known(name(end))}};
 }
@@ -111,7 +101,7 @@ std::string clockText(double seconds)
 std::string volumeText(const Played& played)
 {
     constexpr double percent = 100;
-    if (const auto volume = meanVolume(played))
+    if (const auto volume = played.meanVolume())
         return fmt::format("{:.0f} %", *volume * percent);
     return played.mutedSeconds > 0 ? "muted" : "-";
 }
@@ -144,7 +134,7 @@ std::string sessionsCsv(const std::vector<SessionLine>& lines)
 {
     std::string text = "session,began,application,seconds,device,mean_volume,faults,end\n";
     for (const auto& [session, played, devices, end] : lines) {
-        const auto volume = meanVolume(played);
+        const auto volume = played.meanVolume();
         text += fmt::format("{},{},{},{},{},{},{},{}\n", session.id, utcText(session.began),
                             csvField(session.application), decimal(played.seconds, secondDecimals), csvField(devices),
                             volume ? decimal(*volume, volumeDecimals) : "", played.faults, name(end));

@@ -81,8 +81,8 @@ private:
                         name(end)));
         if (!devices.empty())
             add("on       " + printable(devices));
-        add(fmt::format("at       {}{}{}", volumeText(played), meanVolume(played) ? " on average" : "",
-                        played.mutedSeconds > 0 && meanVolume(played)
+        add(fmt::format("at       {}{}{}", volumeText(played), played.meanVolume() ? " on average" : "",
+                        played.mutedSeconds > 0 && played.meanVolume()
                             ? fmt::format("; muted for {}", clockText(played.mutedSeconds))
                             : ""));
         std::int64_t late = 0;
@@ -155,7 +155,7 @@ private:
 
     [[nodiscard]] std::string_view volumeSign(const Played& cell) const
     {
-        if (const auto volume = meanVolume(cell)) {
+        if (const auto volume = cell.meanVolume()) {
             const auto step = static_cast<std::size_t>(std::ceil(*volume * static_cast<double>(blocks.size())));
             return (isUTF8_ ? blocks : digits)[std::clamp<std::size_t>(step, 1, blocks.size()) - 1];
         }

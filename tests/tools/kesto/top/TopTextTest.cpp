@@ -119,7 +119,7 @@ TEST_F(TopText, IsCutToTheTerminal)
     const auto lines =
         topLines(look({stream(1, "a", now, 0.5, 0), stream(2, "b", now, 0.5, 0)}), {}, {.width = 20, .height = 4});
     EXPECT_THAT(lines,
-                ElementsAre("2023-11-14 22:15:30", "kestod 1.2.3, runni…", "clients   3 connect…", "and 7 lines more"));
+                ElementsAre("2023-11-14 22:15:30", "kestod 1.2.3, runni…", "clients   3 connect…", "and 8 lines more"));
     EXPECT_THAT(topLines(look(), {}, {.height = 1}), ElementsAre("and 9 lines more"));
 }
 

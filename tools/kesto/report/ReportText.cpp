@@ -1,0 +1,271 @@
+// Every table has its key at the left, its figures in columns, and its bar in the room that is left.
+#include "kesto/report/ReportText.h"
+
+#include "foundation/text/LocalTime.h"
+#include "kesto/Terminal.h"
+
+#include <algorithm>
+#include <array>
+#include <fmt/format.h>
+#include <utility>
+
+namespace {
+
+constexpr std::size_t narrowestKey = 11;
+constexpr std::size_t widestKey = 60;
+constexpr std::size_t longestBar = 30;
+constexpr std::size_t shortestBar = 5; // in less room none is drawn
+constexpr std::size_t mostLines = 20; // of a table that was not asked for by its name
+constexpr double secondsAMinute = 60;
+constexpr double secondsAnHour = 3600;
+
+std::string durationText(double seconds)
+{
+    if (seconds < secondsAMinute - 0.5)
+        return fmt::format("{:.0f} s", seconds);
+    if (seconds < secondsAnHour - secondsAMinute / 2)
+        return fmt::format("{:.0f} min", seconds / secondsAMinute);
+    return fmt::format("{:.1f} h", seconds / secondsAnHour);
+}
+
+std::string percentText(double share)
+{
+    constexpr double hundred = 100;
+    return fmt::format("{:.0f} %", share * hundred);
+}
+
+std::string counted(std::size_t count, std::string_view thing)
+{
+    return fmt::format("{} {}{}", count, thing, count == 1 ? "" : "s");
+}
+
+std::string keyText(std::string_view key)
+{
+    return key.empty() ? "(unknown)" : printable(key);
+}
+
+// The longest text of the column sets its width.
+class Table {
+public:
+    struct Column {
+        std::string_view head;
+        std::size_t width;
+    };
+    struct Row {
+        std::string key;
+        std::vector<std::string> figures;
+        double length; // of the bar, before it is measured against the longest
+    };
+
+    Table(std::string_view head, std::vector<Column> columns) : head_(head), columns_(std::move(columns)) { }
+    void add(Row row) { rows_.push_back(std::move(row)); }
+
+    [[nodiscard]] std::string text(const ReportLayout& layout) const
+    {
+        std::size_t figures = 0;
+        for (const Column& column : columns_)
+            figures += 2 + column.width;
+        const std::size_t key = keyColumns(layout.width, figures);
+        const std::size_t behind = columnsFor(layout.width, key + figures + 2);
+        double longest = 0;
+        for (const Row& row : rows_)
+            longest = std::max(longest, row.length);
+        std::string text = line(std::string(head_), heads(), key) + '\n';
+        for (const Row& row : rows_) {
+            text += line(fitted(row.key, key), row.figures, key);
+            if (behind >= shortestBar && row.length > 0)
+                text.append("  ").append(bar(row.length / longest, behind, layout.isUTF8));
+            text += '\n';
+        }
+        return text;
+    }
+
+private:
+    [[nodiscard]] std::size_t keyColumns(std::size_t width, std::size_t figures) const
+    {
+        std::size_t columns = narrowestKey;
+        for (const Row& row : rows_)
+            columns = std::max(columns, std::min(columnsOf(row.key), widestKey));
+        return std::min(columns, std::max(narrowestKey, columnsBehind(figures, width)));
+    }
+    static std::size_t columnsFor(std::size_t width, std::size_t used)
+    {
+        if (width == std::string::npos)
+            return longestBar;
+        return std::min(longestBar, width > used ? width - used : 0);
+    }
+    [[nodiscard]] std::vector<std::string> heads() const
+    {
+        std::vector<std::string> heads;
+        for (const Column& column : columns_)
+            heads.emplace_back(column.head);
+        return heads;
+    }
+    [[nodiscard]] std::string line(std::string key, const std::vector<std::string>& figures, std::size_t columns) const
+    {
+        std::string text = padded(std::move(key), columns);
+        for (std::size_t index = 0; index < figures.size(); ++index)
+            text.append("  ").append(alignedRight(figures[index], columns_[index].width));
+        return text;
+    }
+
+    std::string_view head_;
+    std::vector<Column> columns_;
+    std::vector<Row> rows_;
+};
+
+class ReportPrinter {
+public:
+    ReportPrinter(const Report& report, const ReportLayout& layout) : report_(report), layout_(layout) { }
+
+    std::string print(const std::vector<ReportBy>& tables)
+    {
+        if (report_.all.sessions == 0 && report_.all.faults == 0)
+            return nothing();
+        std::string text = summary() + '\n';
+        for (const ReportBy by : tables)
+            text += table(by, tables.size() == 1);
+        return text + notes();
+    }
+
+private:
+    [[nodiscard]] std::string_view done() const { return report_.isRecording ? "recorded" : "played"; }
+
+    [[nodiscard]] std::string nothing() const
+    {
+        return fmt::format(
+            "Nothing that matches was {} between {} and {}.\n"
+            "Look further back with --since 30d. If that is empty too: nothing may report to kestod (see "
+            "kesto status), or\nstretches = false in analytics.toml turns playing times off.\n",
+            done(), foundation::localTimeText(report_.span.from, "{:%Y-%m-%d %H:%M}"),
+            foundation::localTimeText(report_.span.until, "{:%Y-%m-%d %H:%M}"));
+    }
+
+    [[nodiscard]] std::string summary() const
+    {
+        const std::string_view dot = layout_.isUTF8 ? " · " : "; ";
+        std::string text = fmt::format("{} {} in {}{}", durationText(report_.all.seconds), done(),
+                                       counted(report_.all.sessions, "session"), dot);
+        text += report_.all.faults == 0 ? "no faults" : counted(report_.all.faults, "fault");
+        if (const auto rate = report_.all.faultsAnHour(); rate && report_.all.faults != 0)
+            text += fmt::format(", {:.2f} an hour", *rate);
+        std::string ends = report_.vanished == 0 ? std::string() : fmt::format("{} vanished", report_.vanished);
+        if (report_.running != 0)
+            ends += fmt::format("{}{} still running", ends.empty() ? "" : ", ", report_.running);
+        return ends.empty() ? text : fmt::format("{}{}{}", text, dot, ends);
+    }
+
+    [[nodiscard]] std::string table(ReportBy by, bool isAlone) const
+    {
+        switch (by) {
+        case ReportBy::Day: return days();
+        case ReportBy::Volume: return volumes();
+        case ReportBy::Fault: return faults();
+        default: return lines(by, isAlone);
+        }
+    }
+
+    [[nodiscard]] std::string days() const
+    {
+        // Names of days repeat, and a long time before the first sound says nothing.
+        constexpr std::size_t mostNamed = 28;
+        const bool areNamed = report_.days.size() <= mostNamed;
+        Table table("DAY", {{"PLAYED", 7}});
+        bool hasSound = areNamed;
+        for (const ReportDay& day : report_.days) {
+            hasSound |= day.played.sessions != 0;
+            if (hasSound)
+                table.add({areNamed ? dayName(day.date) : dateText(day.date),
+                           {durationText(day.played.seconds)},
+                           day.played.seconds});
+        }
+        return table.text(layout_);
+    }
+
+    static std::string dayName(std::chrono::year_month_day date)
+    {
+        constexpr std::array<std::string_view, 7> names{"Sun", "Mon", "Tue", "Wed", "Thu", "Fri", "Sat"};
+        const std::chrono::weekday weekday{std::chrono::sys_days(date)};
+        return fmt::format("{} {}", names[weekday.c_encoding()], unsigned{date.day()});
+    }
+
+    [[nodiscard]] std::string shareText(double seconds) const
+    {
+        return report_.all.seconds > 0 ? percentText(seconds / report_.all.seconds) : "";
+    }
+
+    [[nodiscard]] std::string lines(ReportBy by, bool isAlone) const
+    {
+        std::string head(name(by));
+        std::ranges::transform(head, head.begin(), [](char letter) { return static_cast<char>(letter - 'a' + 'A'); });
+        Table table(head, {{"PLAYED", 7}, {"SHARE", 5}, {"VOLUME", 6}, {"FAULTS", 6}, {"/HOUR", 5}});
+        const auto& all = linesOf(report_, by);
+        const std::size_t shown = isAlone ? all.size() : std::min(all.size(), mostLines);
+        double rest = 0;
+        for (std::size_t index = 0; index < all.size(); ++index) {
+            const auto& [key, played] = all[index];
+            const auto volume = played.meanVolume();
+            const auto rate = played.faultsAnHour();
+            if (index < shown)
+                table.add({keyText(key),
+                           {durationText(played.seconds), shareText(played.seconds), volume ? percentText(*volume) : "",
+                            fmt::format("{}", played.faults), rate ? fmt::format("{:.2f}", *rate) : ""},
+                           played.seconds});
+            else
+                rest += played.seconds;
+        }
+        std::string text = table.text(layout_);
+        if (shown < all.size())
+            text += fmt::format("and {} more with {}: --by {} shows all\n", all.size() - shown, durationText(rest),
+                                name(by));
+        return text;
+    }
+
+    [[nodiscard]] std::string volumes() const
+    {
+        Table table("VOLUME", {{"PLAYED", 7}, {"SHARE", 5}});
+        const auto add = [&](std::string key, double seconds) {
+            table.add({std::move(key), {durationText(seconds), shareText(seconds)}, seconds});
+        };
+        if (report_.all.mutedSeconds > 0)
+            add("muted", report_.all.mutedSeconds);
+        for (const auto& [upTo, seconds] : volumeSteps(report_))
+            add(fmt::format("to {:.4g} %", upTo * 100), seconds);
+        if (report_.all.unheardSeconds > 0)
+            add("(unknown)", report_.all.unheardSeconds);
+        return table.text(layout_);
+    }
+
+    [[nodiscard]] std::string faults() const
+    {
+        Table table("FAULT", {{"FAULTS", 7}, {"SESSIONS", 8}});
+        for (const auto& [kind, played] : report_.faultKinds)
+            table.add({keyText(kind),
+                       {fmt::format("{}", played.faults), fmt::format("{}", played.sessions)},
+                       static_cast<double>(played.faults)});
+        return table.text(layout_);
+    }
+
+    [[nodiscard]] std::string notes() const
+    {
+        std::string text;
+        if (report_.all.mutedSeconds > 0)
+            text +=
+                fmt::format("{} of it muted, which no mean volume counts\n", durationText(report_.all.mutedSeconds));
+        if (report_.all.unheardSeconds > 0)
+            text += fmt::format("{} of it by streams that told no volume\n", durationText(report_.all.unheardSeconds));
+        if (report_.isOverlapping)
+            text += "streams at the same time each count: a day may have more than 24 h\n";
+        return text;
+    }
+
+    const Report& report_;
+    const ReportLayout& layout_;
+};
+
+} // namespace
+
+std::string reportText(const Report& report, const std::vector<ReportBy>& tables, const ReportLayout& layout)
+{
+    return ReportPrinter(report, layout).print(tables);
+}
