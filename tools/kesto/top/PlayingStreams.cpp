@@ -25,9 +25,14 @@ void PlayingStreams::refresh()
 std::vector<PlayingStream> PlayingStreams::read()
 {
     refresh();
-    database_->execute("BEGIN"); // one snapshot
     try {
-        std::vector<PlayingStream> streams = readOpen();
+        database_->execute("BEGIN"); // one snapshot
+        std::vector<PlayingStream> streams;
+        if (database_->number("SELECT count(*) FROM sqlite_schema WHERE name = 'open_stretches'") == 0) {
+            database_->execute("COMMIT"); // the service has not stored anything yet
+            return streams;
+        }
+        streams = readOpen();
         readEnded();
         readFaults();
         seen_ = database_->number("SELECT next_event - 1 FROM store");

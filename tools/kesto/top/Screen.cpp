@@ -5,7 +5,6 @@
 #include <cerrno>
 #include <fcntl.h>
 #include <poll.h>
-#include <stdexcept>
 #include <sys/signalfd.h>
 #include <system_error>
 #include <unistd.h>
@@ -18,6 +17,7 @@ constexpr std::string_view begin = "\x1B[?1049h\x1B[?25l\x1B[?7l";
 constexpr std::string_view end = "\x1B[0m\x1B[?7h\x1B[?25h\x1B[?1049l";
 
 constexpr int longestFarewell = 1000; // milliseconds
+constexpr int forEver = -1;
 
 sigset_t setOf(int signal)
 {
@@ -83,7 +83,7 @@ void Screen::show()
         ::tcsetattr(STDIN_FILENO, TCSANOW, &modes);
     }
     if (!std::exchange(isShown_, true))
-        writeOrThrow(begin);
+        isGone_ = !write(begin, forEver);
 }
 
 void Screen::hide() noexcept
@@ -91,7 +91,7 @@ void Screen::hide() noexcept
     if (!isShown_)
         return;
     isShown_ = false;
-    static_cast<void>(write(end, longestFarewell)); // a terminal that is gone needs nothing
+    write(end, longestFarewell);
     if (modesBefore_)
         ::tcsetattr(STDIN_FILENO, TCSANOW, &*modesBefore_);
 }
@@ -105,9 +105,9 @@ void Screen::stop(int signal) const noexcept
     ::pthread_sigmask(SIG_BLOCK, &set, nullptr);
 }
 
-// What the terminal does not take in time, or before a signal comes, which may be the end, is left out. The `errno` of
-// a failure, or 0.
-int Screen::write(std::string_view text, int longestWait) const noexcept
+// What the terminal does not take in time, or before a signal comes, which may be the end, is left out. False if the
+// terminal is gone.
+bool Screen::write(std::string_view text, int longestWait) const noexcept
 {
     while (!text.empty()) {
         const ssize_t count = ::write(output_.get(), text.data(), text.size());
@@ -116,19 +116,12 @@ int Screen::write(std::string_view text, int longestWait) const noexcept
             continue;
         }
         if (count < 0 && errno != EAGAIN && errno != EINTR)
-            return errno;
+            return false;
         std::array<pollfd, 2> room{{{output_.get(), POLLOUT, 0}, {signals_.get(), POLLIN, 0}}};
         if (::poll(room.data(), room.size(), longestWait) == 0 || room[1].revents != 0)
-            return 0;
+            break;
     }
-    return 0;
-}
-
-void Screen::writeOrThrow(std::string_view text) const
-{
-    constexpr int forEver = -1;
-    if (const int error = write(text, forEver); error != 0)
-        throw std::system_error(error, std::generic_category(), "the terminal is gone");
+    return true;
 }
 
 void Screen::draw(const std::vector<std::string>& lines)
@@ -139,7 +132,7 @@ void Screen::draw(const std::vector<std::string>& lines)
     for (const std::string& line : lines)
         (text += line) += &line == &lines.back() ? "\x1B[K" : "\x1B[K\r\n";
     text += "\x1B[J";
-    writeOrThrow(text);
+    isGone_ = !write(text, forEver);
 }
 
 Screen::Events Screen::wait(int descriptor, std::optional<std::chrono::milliseconds> limit)
@@ -147,7 +140,9 @@ Screen::Events Screen::wait(int descriptor, std::optional<std::chrono::milliseco
     std::array<pollfd, 3> watched{
         {{signals_.get(), POLLIN, 0}, {hasKeys_ && isShown_ ? STDIN_FILENO : -1, POLLIN, 0}, {descriptor, POLLIN, 0}}};
     Events events;
-    if (::poll(watched.data(), watched.size(), limit ? static_cast<int>(limit->count()) : -1) <= 0)
+    if (isGone_)
+        events.end = SIGHUP;
+    if (isGone_ || ::poll(watched.data(), watched.size(), limit ? static_cast<int>(limit->count()) : -1) <= 0)
         return events;
     if (watched[0].revents != 0)
         takeSignals(events);
@@ -185,6 +180,6 @@ void Screen::takeKeys(Events& events)
     if (count < 0 && (errno == EINTR || errno == EAGAIN))
         return;
     if (modesBefore_)
-        throw std::runtime_error("the terminal is gone");
+        events.end = SIGHUP; // the terminal is gone
     hasKeys_ = false;
 }

@@ -14,14 +14,14 @@
 #include <termios.h>
 #include <vector>
 
-// One thread; one at a time. Throws std::runtime_error if the terminal is gone.
+// One thread; one at a time.
 class Screen {
 public:
     struct Events {
         std::string keys;
         bool isToDraw = false; // the size has changed, or the program goes on after a stop
         bool isReadable = false; // the descriptor
-        std::optional<int> end; // the signal that ends the program
+        std::optional<int> end; // the signal that ends the program; SIGHUP also if the terminal is gone
     };
 
     Screen();
@@ -43,8 +43,7 @@ private:
     void stop(int signal) const noexcept;
     void takeSignals(Events& events);
     void takeKeys(Events& events);
-    [[nodiscard]] int write(std::string_view text, int longestWait) const noexcept;
-    void writeOrThrow(std::string_view text) const;
+    bool write(std::string_view text, int longestWait) const noexcept;
 
     sigset_t maskBefore_{};
     platform::FileDescriptor signals_;
@@ -52,4 +51,5 @@ private:
     std::optional<termios> modesBefore_; // none: standard input is no terminal
     bool hasKeys_ = true; // until the end of standard input
     bool isShown_ = false;
+    bool isGone_ = false; // the terminal
 };

@@ -178,7 +178,7 @@ public:
     {
     }
 
-    // A signal ends the program as it would have without a screen.
+    // A signal ends the program as it would have without a screen; one that is ignored, with a failure.
     int run()
     {
         const auto signal = showUntilTheEnd();

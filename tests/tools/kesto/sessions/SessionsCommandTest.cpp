@@ -90,7 +90,7 @@ TEST_F(SessionsCommand, ListsThemWithTheirEnds)
     EXPECT_THAT(column(2, {"--running"}), ElementsAre("application", "running"));
     EXPECT_THAT(column(2, {"--faults"}), ElementsAre("application", "running"));
     EXPECT_THAT(column(6, {"--sort", "faults", "--count", "2"}), ElementsAre("faults", "1", "0"));
-    EXPECT_THAT(column(3, {"--sort", "played"}).back(), "10.0") << "the one that stopped by its own stamps";
+    EXPECT_THAT(column(3, {"--sort", "played"}).at(1), "10.0") << "the one that stopped by its own stamps";
     EXPECT_THAT(tool.print({"sessions"}),
                 MatchesRegex("SESSION BEGAN .*\n"
                              "      3 2.* running .*0:0.* 1 speaker .*running\n"

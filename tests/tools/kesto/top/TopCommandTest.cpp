@@ -226,6 +226,7 @@ TEST_F(TopCommand, WhoMayNotReadTheStoreSeesTheRest)
     kestod.startAndAwait();
     for (const char* folder : {"", "run"})
         fs::permissions(kestod.directory() / folder, fs::perms(0755));
+    fs::permissions(kestod.directory() / "state", fs::perms(0700));
     fs::permissions(kestod.socketPath(), fs::perms(0666));
     tool.giveUpRights();
     const std::string look = tool.print({"top"});
@@ -314,7 +315,7 @@ TEST_F(TopCommand, IsDrawnAgainForAnotherSize)
     const auto screen = startScreen({"--delay", "4000"});
     screen->resize(20, 4);
     EXPECT_TRUE(screen->waitFor("and 6 lines more")) << screen->output();
-    EXPECT_THAT(screen->output(), HasSubstr("clients   2 connect…\x1B[K\r\nand 6 lines more\x1B[K\x1B[J"));
+    EXPECT_THAT(screen->output(), HasSubstr("clients   1 connect…\x1B[K\r\r\nand 6 lines more\x1B[K\x1B[J"));
 }
 
 class TopSignal : public TopCommand, public testing::WithParamInterface<int> { };
@@ -390,9 +391,10 @@ TEST_F(TopCommand, WhileItIsStoppedTheTerminalIsTheShells)
 TEST_F(TopCommand, InTheBackgroundItWaitsForTheTerminalAndCanBeEnded)
 {
     kestod.startAndAwait();
-    const auto shell = tool.startShellOnTerminal("set -m; $kesto top --delay 0.01 & until read -r _ _ state _ "
-                                                 "</proc/$!/stat && [[ $state == T ]]; do sleep 0.01; done; echo WAITS;"
-                                                 " kill $!; kill -CONT $!; wait -f $!; echo ended with $?");
+    const auto shell = tool.startShellOnTerminal(
+        "set -m; $kesto top --delay 0.01 & until read -r _ _ state _ "
+        "</proc/$!/stat && [[ $state == T ]]; do sleep 0.01; done; echo WAITS;"
+        " kill $!; kill -CONT $!; while kill -0 $! 2>/dev/null; do sleep 0.01; done; wait $!; echo ended with $?");
     EXPECT_TRUE(shell->waitFor("WAITS")) << shell->output();
     EXPECT_TRUE(shell->waitFor("ended with 143")) << shell->output();
     EXPECT_THAT(shell->output(), Not(HasSubstr(shownScreen)));
