@@ -163,6 +163,7 @@ std::string sessionCsv(const History& history)
 std::string sessionJson(const SessionLine& line, const History& history)
 {
     std::vector<Value> stretches;
+    stretches.reserve(history.stretches.size());
     for (const PlayedStretch& stretch : history.stretches)
         stretches.emplace_back(Dictionary{{"began", stretch.began},
                                           {"seconds", stretch.seconds},
@@ -171,6 +172,7 @@ std::string sessionJson(const SessionLine& line, const History& history)
                                           {"volume", valueOf(stretch.volume)},
                                           {"end", known(endOf(stretch))}});
     std::vector<Value> faults;
+    faults.reserve(history.faults.size());
     for (const Fault& fault : history.faults)
         faults.emplace_back(Dictionary{{"happened", fault.happened},
                                        {"kind", fault.kind},

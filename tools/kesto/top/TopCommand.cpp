@@ -62,6 +62,7 @@ constexpr std::array<OrderChoice, 5> orders{{{'s', "since", TopOrder::Since},
 std::vector<std::string> orderNames()
 {
     std::vector<std::string> names;
+    names.reserve(orders.size());
     for (const OrderChoice& choice : orders)
         names.emplace_back(choice.name);
     return names;
