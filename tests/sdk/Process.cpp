@@ -34,7 +34,9 @@ Pipe makePipe()
     return {platform::FileDescriptor(ends[0]), platform::FileDescriptor(ends[1])};
 }
 
-std::vector<char*> pointers(std::vector<std::string>& texts)
+} // namespace
+
+std::vector<char*> pointersTo(std::vector<std::string>& texts)
 {
     std::vector<char*> all;
     for (std::string& text : texts)
@@ -43,7 +45,7 @@ std::vector<char*> pointers(std::vector<std::string>& texts)
     return all;
 }
 
-std::vector<std::string> merged(const Process::Environment& environment)
+std::vector<std::string> mergedEnvironment(const Process::Environment& environment)
 {
     const auto nameOf = [](std::string_view variable) { return variable.substr(0, variable.find('=')); };
     std::vector<std::string> all;
@@ -53,8 +55,6 @@ std::vector<std::string> merged(const Process::Environment& environment)
     std::ranges::copy_if(environment, std::back_inserter(all), [](const auto& given) { return given.contains('='); });
     return all;
 }
-
-} // namespace
 
 Process::Process(const Arguments& arguments, const Environment& environment)
 {
@@ -67,9 +67,9 @@ Process::Process(const Arguments& arguments, const Environment& environment)
     posix_spawn_file_actions_adddup2(&actions, output.writing.get(), STDOUT_FILENO);
     posix_spawn_file_actions_adddup2(&actions, errors.writing.get(), STDERR_FILENO);
     std::vector<std::string> argumentTexts = arguments;
-    std::vector<std::string> environmentTexts = merged(environment);
+    std::vector<std::string> environmentTexts = mergedEnvironment(environment);
     const int failure = ::posix_spawnp(&identifier_, argumentTexts.front().c_str(), &actions, nullptr,
-                                       pointers(argumentTexts).data(), pointers(environmentTexts).data());
+                                       pointersTo(argumentTexts).data(), pointersTo(environmentTexts).data());
     posix_spawn_file_actions_destroy(&actions);
     if (failure != 0)
         throw std::runtime_error("cannot run " + arguments.front());

@@ -51,6 +51,11 @@ private:
     std::thread collector_;
 };
 
+// The test's environment with these changes.
+[[nodiscard]] std::vector<std::string> mergedEnvironment(const Process::Environment& environment);
+// As `exec` and `posix_spawn` take them; the texts must outlive them.
+[[nodiscard]] std::vector<char*> pointersTo(std::vector<std::string>& texts);
+
 // Runs a program to its end with this input.
 struct Finished {
     std::optional<int> status;

@@ -7,9 +7,12 @@
 #include <CLI/App.hpp>
 #include <CLI/Config.hpp>
 #include <CLI/Formatter.hpp>
+#include <CLI/Validators.hpp>
 
 // Requires a subcommand. For an unknown word the error names the word, instead of a missing subcommand.
 void requireSubcommand(CLI::App& application);
+// For a number of things to show, of which none would make no sense.
+[[nodiscard]] CLI::Validator atLeastOne();
 
 void addBugsCommand(CLI::App& application, int& exitStatus);
 void addChannelsCommand(CLI::App& application, int& exitStatus);
@@ -18,6 +21,8 @@ void addEventsCommand(CLI::App& application, int& exitStatus);
 void addNotifyCommand(CLI::App& application, int& exitStatus);
 void addPrefsCommand(CLI::App& application, int& exitStatus);
 void addReportCommand(CLI::App& application, int& exitStatus);
+void addSessionsCommand(CLI::App& application, int& exitStatus);
 void addStatusCommand(CLI::App& application, int& exitStatus);
 void addSummaryCommand(CLI::App& application, int& exitStatus);
+void addTopCommand(CLI::App& application, int& exitStatus);
 void addTraceCommand(CLI::App& application, int& exitStatus);

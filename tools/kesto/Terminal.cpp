@@ -9,6 +9,7 @@
 #include <cctype>
 #include <cmath>
 #include <cstdlib>
+#include <fmt/format.h>
 #include <sys/ioctl.h>
 #include <unistd.h>
 
@@ -41,6 +42,13 @@ std::size_t controlBytes(std::string_view text)
     const bool isIsolate = second == 0x81 && isWithin(third, 0xA6, 0xA9);
     return first == 0xE2 && (isMarkOrEmbedding || isIsolate) ? 3
                                                              : 0; // U+200E, U+200F, U+202A to U+202E; U+2066 to U+2069
+}
+
+// Zeros if standard output is no terminal, or one that does not tell.
+winsize outputSize()
+{
+    winsize size{};
+    return ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 ? size : winsize{};
 }
 
 } // namespace
@@ -85,12 +93,17 @@ std::string alignedRight(std::string_view text, std::size_t columns)
 
 std::size_t outputWidth()
 {
-    winsize size{};
-    if (::isatty(STDOUT_FILENO) != 0 && ::ioctl(STDOUT_FILENO, TIOCGWINSZ, &size) == 0 && size.ws_col > 0)
+    if (const winsize size = outputSize(); size.ws_col > 0)
         return size.ws_col;
     if (const std::string columns = platform::environment("COLUMNS"); !columns.empty())
         return std::max<std::size_t>(narrowest, std::strtoul(columns.c_str(), nullptr, 10));
     return std::string::npos; // not a terminal: lines are not cut
+}
+
+std::size_t outputHeight()
+{
+    const winsize size = outputSize();
+    return size.ws_row > 0 ? size.ws_row : std::string::npos;
 }
 
 bool showsUTF8()
@@ -126,6 +139,28 @@ std::size_t columnsBehind(std::size_t used, std::size_t width)
     if (width == std::string::npos)
         return width;
     return width > used + least ? width - used : least;
+}
+
+std::string asciiText(std::string_view text)
+{
+    constexpr std::string_view cut = "…";
+    std::string ascii;
+    for (std::size_t index = 0; index < text.size(); ++index)
+        if (static_cast<unsigned char>(text[index]) < 0x80)
+            ascii += text[index];
+        else if (isFirstByte(text[index]))
+            ascii += text.substr(index).starts_with(cut) ? '~' : '?';
+    return ascii;
+}
+
+std::string sizeText(std::uint64_t bytes)
+{
+    constexpr double kilobyte = 1'000;
+    constexpr double megabyte = 1'000'000;
+    const auto size = static_cast<double>(bytes);
+    if (size < kilobyte)
+        return fmt::format("{} B", bytes);
+    return size < megabyte ? fmt::format("{:.0f} kB", size / kilobyte) : fmt::format("{:.1f} MB", size / megabyte);
 }
 
 std::string shownText(const foundation::Value& value)

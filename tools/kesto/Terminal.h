@@ -4,6 +4,7 @@
 
 #include "foundation/values/Value.h"
 
+#include <cstdint>
 #include <string>
 #include <string_view>
 
@@ -27,8 +28,17 @@
 
 // How many columns standard output has: those of the terminal, else $COLUMNS, else unlimited (npos).
 [[nodiscard]] std::size_t outputWidth();
+// How many lines the terminal of standard output has; unlimited (npos) where there is none.
+[[nodiscard]] std::size_t outputHeight();
 // The rest of the width behind so many columns, but not too little.
 [[nodiscard]] std::size_t columnsBehind(std::size_t used, std::size_t width);
+
+// The text where the terminal does not show UTF-8: "~" for the sign of a cut, "?" for every other character that ASCII
+// does not have.
+[[nodiscard]] std::string asciiText(std::string_view text);
+
+// 35200000 as "35.2 MB".
+[[nodiscard]] std::string sizeText(std::uint64_t bytes);
 
 // A string as it is, a date in ISO 8601, anything else as JSON.
 [[nodiscard]] std::string shownText(const foundation::Value& value);

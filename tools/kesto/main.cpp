@@ -2,9 +2,12 @@
 #include "kesto/Commands.h"
 
 #include <CLI/Error.hpp>
+#include <charconv>
+#include <cstdint>
 #include <cstdio>
 #include <exception>
 #include <stdexcept>
+#include <string>
 
 void requireSubcommand(CLI::App& application)
 {
@@ -13,6 +16,18 @@ void requireSubcommand(CLI::App& application)
         if (application.get_subcommands().empty())
             throw CLI::RequiredError::Subcommand(1);
     });
+}
+
+CLI::Validator atLeastOne()
+{
+    return CLI::Validator(
+        [](const std::string& text) {
+            std::int64_t number = 0;
+            const char* const end = text.data() + text.size();
+            const bool isNumber = std::from_chars(text.data(), end, number).ptr == end;
+            return isNumber && number >= 1 ? std::string() : "\"" + text + "\" is not a number from 1 on";
+        },
+        "");
 }
 
 int main(int argumentCount, char** arguments)
@@ -28,8 +43,10 @@ int main(int argumentCount, char** arguments)
     addNotifyCommand(application, exitStatus);
     addPrefsCommand(application, exitStatus);
     addReportCommand(application, exitStatus);
+    addSessionsCommand(application, exitStatus);
     addStatusCommand(application, exitStatus);
     addSummaryCommand(application, exitStatus);
+    addTopCommand(application, exitStatus);
     addTraceCommand(application, exitStatus);
     try {
         application.parse(argumentCount, arguments);

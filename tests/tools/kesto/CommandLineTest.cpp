@@ -24,7 +24,7 @@ TEST_F(CommandLine, SaysItsVersion)
 TEST_F(CommandLine, HelpNamesEveryVerb)
 {
     const std::string help = tool.print({"--help"});
-    for (const char* verb : {"client", "events", "notify", "prefs", "status", "summary", "trace"}) {
+    for (const char* verb : {"client", "events", "notify", "prefs", "sessions", "status", "summary", "top", "trace"}) {
         EXPECT_THAT(help, HasSubstr(verb));
         EXPECT_THAT(tool.print({verb, "--help"}), HasSubstr("Usage: kesto"));
     }

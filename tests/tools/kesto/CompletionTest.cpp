@@ -45,6 +45,9 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
     EXPECT_THAT(completions("client --w"), ElementsAre("--wait"));
     EXPECT_THAT(completions("events --count \"\""), IsEmpty());
     EXPECT_THAT(completions("events --since 1"), UnorderedElementsAre("10m", "1h"));
+    EXPECT_THAT(completions("top --sort d"), ElementsAre("device"));
+    EXPECT_THAT(completions("sessions --sort p"), ElementsAre("played"));
+    EXPECT_THAT(completions("top --delay \"\""), IsEmpty());
     EXPECT_THAT(completions("notify com"), ElementsAre("com.quarn.halden.ringerstate"));
     EXPECT_THAT(completions("report --by d"), UnorderedElementsAre("day", "device"));
     EXPECT_THAT(completions("unknown \"\""), IsEmpty());
@@ -52,8 +55,9 @@ TEST_F(Completion, NamesVerbsAndTheirOptions)
 
 TEST_F(Completion, NamesEveryOptionThatTheToolHas)
 {
-    for (const std::string verb : {"bugs", "channels", "client", "events", "report", "status", "summary", "notify",
-                                   "trace", "trace record", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
+    for (const std::string verb :
+         {"bugs", "channels", "client", "events", "report", "sessions", "status", "summary", "notify", "top", "trace",
+          "trace record", "prefs get", "prefs set", "prefs unset", "prefs list"}) {
         std::istringstream help(tool.runShell("$kesto " + verb + " --help").output);
         const auto offered = completions(verb + " --");
         for (std::string word; help >> word;)

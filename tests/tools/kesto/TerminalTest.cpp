@@ -1,5 +1,6 @@
 // The text for a terminal, and its width.
 #include "kesto/Terminal.h"
+#include "support/EnvironmentVariable.h"
 
 #include <cmath>
 #include <cstdlib>
@@ -106,6 +107,22 @@ TEST(ColumnsBehind, LeavesSomethingOfANarrowTerminal)
     EXPECT_EQ(columnsBehind(60, 61), 8U);
     EXPECT_EQ(columnsBehind(60, 10), 8U);
     EXPECT_EQ(columnsBehind(60, std::string::npos), std::string::npos);
+}
+
+TEST(AsciiText, KeepsTheColumns)
+{
+    EXPECT_EQ(asciiText("plain"), "plain");
+    EXPECT_EQ(asciiText("Küche ☕…"), "K?che ?~");
+    EXPECT_EQ(asciiText("\x9B"
+                        "31m"),
+              "31m"); // no character at all
+}
+
+TEST(SizeText, HasAUnit)
+{
+    EXPECT_EQ(sizeText(999), "999 B");
+    EXPECT_EQ(sizeText(4'000), "4 kB");
+    EXPECT_EQ(sizeText(35'249'999), "35.2 MB");
 }
 
 TEST(ShownText, IsTextAsItIsAndElseJson)

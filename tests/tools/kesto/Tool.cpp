@@ -63,11 +63,26 @@ std::unique_ptr<Process> Tool::start(const Arguments& arguments) const
     return std::make_unique<Process>(command(arguments), lastOfEach(environment_));
 }
 
-Finished Tool::runShell(const std::string& script) const
+std::unique_ptr<TerminalProcess> Tool::startOnTerminal(const Arguments& arguments) const
+{
+    return std::make_unique<TerminalProcess>(command(arguments), lastOfEach(environment_));
+}
+
+Process::Environment Tool::environmentOfShell() const
 {
     Process::Environment environment = lastOfEach(environment_);
     environment.emplace_back(std::string("kesto=") + KESTO_PATH);
-    return sdk_test::run({"sh", "-c", script}, {}, environment);
+    return environment;
+}
+
+std::unique_ptr<TerminalProcess> Tool::startShellOnTerminal(const std::string& script) const
+{
+    return std::make_unique<TerminalProcess>(Arguments{"bash", "-c", script}, environmentOfShell());
+}
+
+Finished Tool::runShell(const std::string& script) const
+{
+    return sdk_test::run({"sh", "-c", script}, {}, environmentOfShell());
 }
 
 } // namespace kesto_tool

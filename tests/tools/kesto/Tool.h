@@ -3,6 +3,7 @@
 
 #include "sdk/Process.h"
 #include "support/TemporaryDirectory.h"
+#include "tools/kesto/TerminalProcess.h"
 
 #include <filesystem>
 #include <memory>
@@ -32,10 +33,15 @@ public:
     // The output of a run that must succeed without error messages.
     [[nodiscard]] std::string print(const Arguments& arguments, const std::string& input = {}) const;
     [[nodiscard]] std::unique_ptr<Process> start(const Arguments& arguments) const;
+    // On a terminal of its own.
+    [[nodiscard]] std::unique_ptr<TerminalProcess> startOnTerminal(const Arguments& arguments) const;
+    // A script of bash on a terminal of its own, with the program's path as $kesto.
+    [[nodiscard]] std::unique_ptr<TerminalProcess> startShellOnTerminal(const std::string& script) const;
     // Runs a shell command, with the program's path as $kesto.
     [[nodiscard]] Finished runShell(const std::string& script) const;
 
 private:
+    [[nodiscard]] Process::Environment environmentOfShell() const;
     [[nodiscard]] Process::Arguments command(const Arguments& arguments) const;
 
     Process::Environment environment_;

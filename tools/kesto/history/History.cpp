@@ -13,11 +13,14 @@
 #include <fmt/format.h>
 #include <iterator>
 #include <optional>
+#include <string_view>
 #include <utility>
 
 namespace {
 
 using platform::SqliteStatement;
+
+constexpr std::string_view serviceEnded = "service-ended";
 
 double present()
 {
@@ -73,8 +76,8 @@ private:
                                               database_.path().native()));
     }
 
-    // `row`: session, recording, began, device, format, volume.
-    void add(const SqliteStatement& row, double seconds, bool isRunning, bool hasVanished)
+    // `row`: session, recording, began, device, format, volume. The ending is that of the store; of what runs, empty.
+    void add(const SqliteStatement& row, double seconds, std::string_view ending)
     {
         const std::int64_t session = row.integer(0);
         const bool isAskedFor = (row.integer(1) != 0) == question_.isRecording;
@@ -89,8 +92,9 @@ private:
                                       .device = std::string(row.text(3)),
                                       .format = std::string(row.text(4)),
                                       .volume = realAt(row, 5),
-                                      .isRunning = isRunning,
-                                      .hasVanished = hasVanished});
+                                      .isRunning = ending.empty(),
+                                      .hasVanished = ending == "vanished",
+                                      .hasServiceEnded = ending == serviceEnded});
         if (auto& volume = history_.stretches.back().volume)
             volume = std::clamp(*volume, 0.0, 1.0);
     }
@@ -105,8 +109,7 @@ private:
     {
         const auto statement = database_.prepare(history_queries::stretches);
         bindSpan(statement);
-        database_.forEachRow(statement,
-                             [this](const SqliteStatement& row) { add(row, row.real(6), false, row.integer(7) != 0); });
+        database_.forEachRow(statement, [this](const SqliteStatement& row) { add(row, row.real(6), row.text(7)); });
     }
 
     // As the service ends them at its next start, if it was killed: they ran until its last transaction. Two clocks
@@ -122,7 +125,7 @@ private:
             const double began = row.real(2);
             const double seconds = platform::lengthOfTime(row.real(6), history_.now);
             if (began < question_.span.until && began + seconds > question_.span.from && (isRunning || seconds > 0))
-                add(row, seconds, isRunning, false);
+                add(row, seconds, isRunning ? "" : serviceEnded);
         });
     }
 

@@ -27,6 +27,7 @@ struct PlayedStretch {
     std::optional<double> volume = {}; // 0 to 1; 0: muted
     bool isRunning = false;
     bool hasVanished = false; // its client's connection ended without a word
+    bool hasServiceEnded = false; // before it did
 };
 
 struct HistorySession {

@@ -8,7 +8,7 @@ namespace history_queries {
 constexpr std::string_view tableCount = "SELECT count(*) FROM sqlite_schema WHERE type = 'table' AND name IN"
                                         " ('stretches', 'open_stretches', 'sessions', 'sources', 'store')";
 constexpr std::string_view stretches =
-    "SELECT session, recording, began, device, format, volume, seconds, ending = 'vanished' FROM stretches"
+    "SELECT session, recording, began, device, format, volume, seconds, ending FROM stretches"
     " WHERE began < ?1 AND began + seconds > ?2";
 constexpr std::string_view lastWord = "SELECT wall_time FROM store WHERE wall_time IS NOT NULL";
 constexpr std::string_view openStretches =

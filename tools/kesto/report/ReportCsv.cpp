@@ -6,9 +6,7 @@
 #include <fmt/format.h>
 #include <iterator>
 
-namespace {
-
-std::string field(std::string_view text)
+std::string csvField(std::string_view text)
 {
     std::string shown = printable(text);
     if (shown.find_first_of(",\"") == std::string::npos)
@@ -18,6 +16,8 @@ std::string field(std::string_view text)
         quoted += character == '"' ? std::string("\"\"") : std::string(1, character);
     return quoted + '"';
 }
+
+namespace {
 
 std::string secondsText(double seconds)
 {
@@ -39,7 +39,7 @@ public:
     explicit Table(std::string head) : text_(std::move(head)) { text_ += '\n'; }
     template <typename Figures> void add(std::string_view key, const Figures& figures)
     {
-        fmt::format_to(std::back_inserter(text_), "{},{}\n", field(key), figures);
+        fmt::format_to(std::back_inserter(text_), "{},{}\n", csvField(key), figures);
     }
     [[nodiscard]] std::string take() { return std::move(text_); }
 

@@ -4,6 +4,9 @@
 #include "kesto/report/ReportTable.h"
 
 #include <string>
+#include <string_view>
 
 // docs/report.md describes the columns.
 [[nodiscard]] std::string reportCsv(const Report& report, ReportBy by);
+// A name of clients as a field: what would move a terminal's cursor is replaced, what would divide a row is quoted.
+[[nodiscard]] std::string csvField(std::string_view text);

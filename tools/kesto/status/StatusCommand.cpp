@@ -20,9 +20,6 @@ namespace {
 
 using foundation::Dictionary;
 
-constexpr int exitLosses = 1;
-constexpr int exitNotRunning = 3;
-
 struct StatusOptions {
     std::filesystem::path socket;
     std::filesystem::path ledgerFile;
@@ -32,13 +29,6 @@ struct StatusOptions {
     double interval = 2;
     std::optional<std::size_t> count;
 };
-
-int exitStatusOf(const Dictionary& report)
-{
-    if (!report.find("running")->asBoolean())
-        return exitNotRunning;
-    return ledger::lossesIn(*report.find("sinceStart")->dictionary()) == 0 ? exitOk : exitLosses;
-}
 
 class StatusRun {
 public:

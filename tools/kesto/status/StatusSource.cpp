@@ -2,6 +2,7 @@
 #include "kesto/status/StatusSource.h"
 
 #include "foundation/cbor/Cbor.h"
+#include "kesto/ExitStatus.h"
 #include "kesto/Terminal.h"
 #include "kesto/files/InputFile.h"
 #include "ledger/Report.h"
@@ -18,6 +19,13 @@
 #include <system_error>
 
 using foundation::Dictionary;
+
+int exitStatusOf(const Dictionary& report)
+{
+    if (!report.find("running")->asBoolean())
+        return exitNotRunning;
+    return ledger::lossesIn(*report.find("sinceStart")->dictionary()) == 0 ? exitOk : exitFailure;
+}
 
 StatusError StatusSource::noAnswer(std::string_view why) const
 {
@@ -72,7 +80,7 @@ std::string StatusSource::receiveFrame()
     }
 }
 
-Dictionary StatusSource::ask()
+void StatusSource::ask()
 {
     std::string item;
     foundation::appendCbor(foundation::Array{1, "status"}, item);
@@ -80,6 +88,12 @@ Dictionary StatusSource::ask()
     platform::appendFrame(item, request);
     if (::send(connection_.get(), request.data(), request.size(), MSG_NOSIGNAL) != std::ssize(request))
         throw systemFailure();
+    isAsked_ = true;
+}
+
+Dictionary StatusSource::answer()
+{
+    isAsked_ = false;
     foundation::CborDecoder decoder;
     const auto answer = decoder.decode(receiveFrame());
     const auto values = answer ? answer->array() : std::nullopt;
@@ -105,14 +119,31 @@ Dictionary StatusSource::readLedger() const
     return ledger::report(*account, true);
 }
 
-Dictionary StatusSource::read()
+int StatusSource::request()
 {
-    if (connection_) {
+    if (!isAsked_ && connection_) {
         try {
-            return ask();
+            ask();
         } catch (const StatusError&) {
             connection_ = platform::FileDescriptor(); // the service has ended meanwhile; another may run
         }
     }
-    return isConnected() ? ask() : readLedger();
+    if (!isAsked_ && isConnected())
+        ask();
+    return isAsked_ ? connection_.get() : -1;
+}
+
+Dictionary StatusSource::read()
+{
+    const bool isKept = static_cast<bool>(connection_);
+    if (request() < 0)
+        return readLedger();
+    try {
+        return answer();
+    } catch (const StatusError&) {
+        connection_ = platform::FileDescriptor();
+        if (!isKept)
+            throw;
+    }
+    return read();
 }

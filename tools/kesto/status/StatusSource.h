@@ -17,6 +17,11 @@ public:
     using std::runtime_error::runtime_error;
 };
 
+// How a command ends that asked for the status: 0 if the service lost nothing since its start, 1 if it did, 3 if it
+// does not run or does not answer.
+constexpr int exitNotRunning = 3;
+[[nodiscard]] int exitStatusOf(const foundation::Dictionary& report);
+
 // One thread.
 class StatusSource {
 public:
@@ -26,13 +31,17 @@ public:
     {
     }
 
+    // Asks the service, for a caller that waits for other things, too: `read` does not wait once this descriptor can be
+    // read. -1: it need not wait at all. Throws StatusError.
+    [[nodiscard]] int request();
     // The report (`ledger::report`) of the service that listens at the socket; if none does, that of the ledger's file.
     // Waits at most ten seconds for the service. Throws StatusError.
     [[nodiscard]] foundation::Dictionary read();
 
 private:
     [[nodiscard]] bool isConnected();
-    [[nodiscard]] foundation::Dictionary ask();
+    void ask();
+    [[nodiscard]] foundation::Dictionary answer();
     [[nodiscard]] std::string receiveFrame();
     [[nodiscard]] foundation::Dictionary readLedger() const;
     [[nodiscard]] StatusError noAnswer(std::string_view why) const;
@@ -41,4 +50,5 @@ private:
     const std::filesystem::path socket_;
     const std::filesystem::path ledgerFile_;
     platform::FileDescriptor connection_; // kept, because the service stores an event for each that ends
+    bool isAsked_ = false; // over the connection, and not answered yet
 };

@@ -25,16 +25,6 @@ std::string moment(std::uint64_t seconds)
     return foundation::localTimeText(static_cast<double>(seconds), "{:%Y-%m-%d %H:%M:%S}");
 }
 
-std::string sizeText(std::uint64_t bytes)
-{
-    constexpr double kilobyte = 1'000;
-    constexpr double megabyte = 1'000'000;
-    const auto size = static_cast<double>(bytes);
-    if (size < kilobyte)
-        return fmt::format("{} B", bytes);
-    return size < megabyte ? fmt::format("{:.0f} kB", size / kilobyte) : fmt::format("{:.1f} MB", size / megabyte);
-}
-
 class StatusTables {
 public:
     StatusTables(const Dictionary& report, std::size_t width)

@@ -28,10 +28,13 @@ using testing::Optional;
 std::vector<std::string> linesOf(const History& history)
 {
     std::vector<std::string> lines;
-    for (const auto& [session, began, seconds, device, format, volume, isRunning, hasVanished] : history.stretches)
+    for (const auto& [session, began, seconds, device, format, volume, isRunning, hasVanished, hasServiceEnded] :
+         history.stretches)
         lines.push_back(fmt::format("{} {}+{} {} {} {}{}{}", session, began, seconds, device, format,
                                     volume ? fmt::format("{}", *volume) : "?", isRunning ? " running" : "",
-                                    hasVanished ? " vanished" : ""));
+                                    hasVanished           ? " vanished"
+                                        : hasServiceEnded ? " cut off"
+                                                          : ""));
     return lines;
 }
 
@@ -239,7 +242,7 @@ protected:
 
 TEST_F(HistoryOfRunningSessions, EndsWithTheLastWordOfAKilledService)
 {
-    EXPECT_THAT(linesOf(read()), ElementsAre("1 999+200 speaker S16LE/48000/2 0.25"));
+    EXPECT_THAT(linesOf(read()), ElementsAre("1 999+200 speaker S16LE/48000/2 0.25 cut off"));
     EXPECT_EQ(read().now, 1200);
     EXPECT_THAT(linesOf(read({.span = {.from = 1199}})), IsEmpty());
     EXPECT_THAT(linesOf(read({.span = {.until = 999}})), IsEmpty());
