@@ -1,5 +1,4 @@
-// The room of the page: the report as one page that any browser shows. It runs no script, loads nothing, and asks
-// nobody.
+// The report as one page that any browser shows: it runs no script, loads nothing, and asks nobody.
 //
 // What clients told is shown as text and as nothing else, whatever it contains. The page stays below 100,000 bytes: of
 // many applications and devices it names those with the most time, many days become weeks, and marks lose the notes

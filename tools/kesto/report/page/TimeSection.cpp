@@ -18,6 +18,8 @@ constexpr double height = 282;
 constexpr double left = 44;
 constexpr double top = 26;
 constexpr double bottom = 238;
+constexpr double widest = 64; // a bar
+constexpr double roomForName = 48;
 
 // Colours and names, in the order of the report; behind the named ones stand all others together.
 class Applications {
@@ -114,7 +116,6 @@ private:
 
     void drawColumn(const PageColumn& column, double x)
     {
-        constexpr double widest = 64;
         constexpr double gap = 1;
         const double barWidth = std::min(pitch_ * 0.7, widest);
         const double barLeft = x + (pitch_ - barWidth) / 2;
@@ -153,54 +154,69 @@ private:
         return note;
     }
 
-    // As much as there is room for: below days first the number, then only Mondays; below others, every so many.
     void drawLabel(std::size_t index)
     {
-        constexpr double roomForName = 48;
-        constexpr double roomForNumber = 24;
         const PageColumn& column = columns_.columns[index];
-        const double x = leftOf(index) + pitch_ / 2;
-        const std::string name = columns_.name(column);
-        const bool isDay = columns_.unit == ColumnUnit::Day;
-        const auto every = static_cast<std::size_t>(std::ceil(1.3 * roomForName / pitch_));
-        std::string label;
-        if (isDay && pitch_ >= roomForName)
-            label = name.substr(0, name.rfind(' '));
-        else if (isDay && pitch_ >= roomForNumber)
-            label = fmt::format("{}", static_cast<unsigned>(column.first.day()));
-        else if (isDay ? chrono::weekday(chrono::sys_days(column.first)) == chrono::Monday && isFarFromEnd(x)
-                       : index % every == 0)
-            label = columns_.unit == ColumnUnit::Year
-                ? name
-                : fmt::format("{}{}",
-                              columns_.unit == ColumnUnit::Month
-                                  ? std::string()
-                                  : fmt::format("{} ", static_cast<unsigned>(column.first.day())),
-                              monthName(column.first).substr(0, 3));
+        const bool isBold = columns_.unit == ColumnUnit::Day && isWeekend(column.first);
+        const std::string label =
+            columns_.unit == ColumnUnit::Day ? labelOfDay(column, index) : labelOfMany(column, index);
         if (!label.empty())
-            svg_.text(isDay && isWeekend(column.first) ? "ax we" : "ax", x, bottom + 18, Svg::Anchor::Middle, label);
-        drawMonth(index);
+            svg_.text(isBold ? "ax we" : "ax", leftOf(index) + pitch_ / 2, bottom + 18, Svg::Anchor::Middle, label);
+        if (beginsMonth(index) && hasRoomForMonth(index))
+            svg_.text("ax", leftOf(index) + std::max(0.0, (pitch_ - widest) / 2), bottom + 38, Svg::Anchor::Start,
+                      fmt::format("{} {}", monthName(column.first), static_cast<int>(column.first.year())));
     }
 
-    [[nodiscard]] static bool isFarFromEnd(double x) { return x < width - 16; }
+    // "Sun 8" if there is room, else the number, else only Mondays: "9 Nov".
+    [[nodiscard]] std::string labelOfDay(const PageColumn& column, std::size_t index) const
+    {
+        constexpr double roomForNumber = 24;
+        constexpr double halfOfLabel = 16;
+        const std::string name = columns_.name(column); // "Sun 8 Nov"
+        if (pitch_ >= roomForName)
+            return name.substr(0, name.rfind(' '));
+        if (pitch_ >= roomForNumber)
+            return fmt::format("{}", static_cast<unsigned>(column.first.day()));
+        const bool isMonday = chrono::weekday(chrono::sys_days(column.first)) == chrono::Monday;
+        return isMonday && leftOf(index) < width - halfOfLabel ? name.substr(name.find(' ') + 1) : std::string();
+    }
 
-    // Below the first column of each month, where it is not so near the end that it would be cut off.
-    void drawMonth(std::size_t index)
+    // Of weeks, months and years, as many as there is room for.
+    [[nodiscard]] std::string labelOfMany(const PageColumn& column, std::size_t index) const
+    {
+        const auto every = static_cast<std::size_t>(std::ceil(1.3 * roomForName / pitch_));
+        if (index % every != 0)
+            return {};
+        const auto month = monthName(column.first).substr(0, 3);
+        if (columns_.unit == ColumnUnit::Week)
+            return fmt::format("{} {}", static_cast<unsigned>(column.first.day()), month);
+        const int year = static_cast<int>(column.first.year());
+        return columns_.unit == ColumnUnit::Month ? fmt::format("{} {}", month, year) : fmt::format("{}", year);
+    }
+
+    [[nodiscard]] bool isInMonthOf(std::size_t one, std::size_t other) const
+    {
+        const auto monthOf = [this](std::size_t index) {
+            const auto& first = columns_.columns[index].first;
+            return first.year() / first.month();
+        };
+        return monthOf(one) == monthOf(other);
+    }
+
+    [[nodiscard]] bool beginsMonth(std::size_t index) const
+    {
+        const bool hasDays = columns_.unit == ColumnUnit::Day || columns_.unit == ColumnUnit::Week;
+        return hasDays && (index == 0 || !isInMonthOf(index - 1, index));
+    }
+
+    // Up to where the next month begins, and up to the end of the picture.
+    [[nodiscard]] bool hasRoomForMonth(std::size_t index) const
     {
         constexpr double roomForMonth = 100;
-        const auto& columns = columns_.columns;
-        const auto monthOf = [](const PageColumn& column) { return column.first.year() / column.first.month(); };
-        if (columns_.unit != ColumnUnit::Day && columns_.unit != ColumnUnit::Week)
-            return;
-        const bool isFirst = index == 0 || monthOf(columns[index - 1]) != monthOf(columns[index]);
-        // The rest of a month before the first of the next has no room for its name.
-        const std::size_t behind = index + static_cast<std::size_t>(roomForMonth / pitch_) + 1;
-        const bool isCrowded = index == 0 && columns.size() > 1 && behind <= columns.size()
-            && monthOf(columns[std::min(behind, columns.size()) - 1]) != monthOf(columns[0]);
-        if (!isFirst || isCrowded || (index != 0 && leftOf(index) > width - roomForMonth))
-            return;
-        svg_.text("ax", leftOf(index) + std::max(0.0, (pitch_ - 64) / 2), bottom + 38, Svg::Anchor::Start,
-                  fmt::format("{} {}", monthName(columns[index].first), static_cast<int>(columns[index].first.year())));
+        for (std::size_t next = index + 1; next < columns_.columns.size(); ++next)
+            if (!isInMonthOf(index, next))
+                return leftOf(next) - leftOf(index) >= roomForMonth;
+        return index == 0 || leftOf(index) <= width - roomForMonth;
     }
 
     const PageColumns& columns_;

@@ -120,6 +120,7 @@ private:
             for (const Fault& fault : worst_.faults)
                 found.insert(stepAt(fault.happened));
             std::vector<double> ticks;
+            ticks.reserve(found.size());
             for (const auto step : found)
                 ticks.push_back((static_cast<double>(step) + 0.5) * width / static_cast<double>(steps_));
             svg_.ticks("tick", ticks, tickTop, tickBottom);
