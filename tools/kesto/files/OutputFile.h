@@ -7,3 +7,7 @@
 // Writes the text to the path. If something exists there, it writes into it: a device and a pipe stay what they are.
 // Throws std::runtime_error, which names the path.
 void writeOutput(const std::filesystem::path& path, std::string_view text);
+
+// The same, but whoever opens a file at the path finds the old text or the new one, never a part: it is written beside
+// its place and renamed, with the permissions of the file that it replaces. A link goes on to lead to it.
+void writeWholeOutput(const std::filesystem::path& path, std::string_view text);

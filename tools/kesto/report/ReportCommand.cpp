@@ -1,24 +1,29 @@
-// `kesto report`: what was played or recorded in a span of time, as tables for people, as CSV and as JSON.
+// `kesto report`: what was played or recorded in a span of time, as tables for people, as CSV, as JSON and as a page.
 #include "kesto/Commands.h"
 #include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
+#include "kesto/files/OutputFile.h"
 #include "kesto/report/Calendar.h"
 #include "kesto/report/Report.h"
 #include "kesto/report/ReportCsv.h"
 #include "kesto/report/ReportJson.h"
 #include "kesto/report/ReportText.h"
+#include "kesto/report/page/ReportPage.h"
 #include "kesto/results/MomentText.h"
+#include "platform/linux/process/Environment.h"
 
 #include <algorithm>
 #include <array>
 #include <charconv>
 #include <chrono>
+#include <climits>
 #include <cmath>
 #include <cstdlib>
 #include <ctime>
 #include <fmt/format.h>
 #include <memory>
 #include <string>
+#include <unistd.h>
 #include <vector>
 
 namespace {
@@ -36,6 +41,7 @@ struct ReportOptions {
     bool isUTC = false;
     bool isCsv = false;
     bool isJson = false;
+    std::string page; // the path of the file; "-": standard output
 };
 
 // The last day of the report and the six before it are a week.
@@ -117,6 +123,45 @@ std::string textOf(const Report& report, const ReportOptions& options)
     return reportText(report, tables, {.width = outputWidth(), .isUTF8 = showsUTF8()});
 }
 
+std::string hostName()
+{
+    std::array<char, HOST_NAME_MAX + 1> name{};
+    return ::gethostname(name.data(), name.size() - 1) == 0 ? name.data() : "this device";
+}
+
+// As its tables call it: "Europe/Berlin".
+std::string timeZoneName(bool isUTC)
+{
+    if (isUTC)
+        return "UTC";
+    std::string name = platform::environment("TZ");
+    if (name.starts_with(':'))
+        name.erase(0, 1);
+    std::error_code missing;
+    if (name.empty())
+        name = std::filesystem::read_symlink("/etc/localtime", missing);
+    constexpr std::string_view folder = "zoneinfo/";
+    if (const auto place = name.rfind(folder); place != std::string::npos)
+        name.erase(0, place + folder.size());
+    return name.empty() ? "the time zone of this device" : name;
+}
+
+void writePage(const Report& report, const ReportOptions& options)
+{
+    const std::string page =
+        reportPage(report,
+                   {.host = hostName(),
+                    .database = options.database,
+                    .made = present(),
+                    .timeZone = timeZoneName(options.isUTC)
+                        + (options.dayStarts.empty() ? std::string() : ", each from " + options.dayStarts),
+                    .isUTC = options.isUTC});
+    if (options.page == "-")
+        fmt::print("{}", page);
+    else
+        writeWholeOutput(options.page, page);
+}
+
 std::vector<std::string> tableNames()
 {
     std::vector<std::string> names;
@@ -137,8 +182,9 @@ void addReportCommand(CLI::App& application, int& exitStatus)
     command->add_option("--since", options->since,
                         "From then on, in place of seven days: 90s, 10m, 2h, 30d ago, or a time such as 2026-01-31");
     command->add_option("--until", options->until, "Until then, in place of now: as for --since");
-    command->add_option("--by", options->by, "One table: by day, application, device, volume, format or fault")
-        ->check(CLI::IsMember(tableNames()).description(""));
+    CLI::Option* by =
+        command->add_option("--by", options->by, "One table: by day, application, device, volume, format or fault")
+            ->check(CLI::IsMember(tableNames()).description(""));
     command->add_option("--application", options->question.applications,
                         "Only applications with matching names, such as 'org.example.*'");
     command->add_option("--device", options->question.devices, "Only matching devices, such as '*headset*'");
@@ -146,15 +192,24 @@ void addReportCommand(CLI::App& application, int& exitStatus)
     command->add_flag("--utc", options->isUTC, "Days and times of UTC, in place of this device's time zone");
     command->add_flag("--recording", options->question.isRecording, "What was recorded, in place of what was played");
     CLI::Option* csv = command->add_flag("--csv", options->isCsv, "One table as CSV, by day if --by says no other");
-    command->add_flag("--json", options->isJson, "All figures as one JSON object, for programs")->excludes(csv);
+    CLI::Option* json =
+        command->add_flag("--json", options->isJson, "All figures as one JSON object, for programs")->excludes(csv);
+    command
+        ->add_option("--html", options->page,
+                     "A page with pictures for a browser, into that file; -: to standard output")
+        ->excludes(by)
+        ->excludes(csv)
+        ->excludes(json);
     command->callback([options, &exitStatus] {
         if (options->database.empty())
             options->database = usualDatabase();
         if (options->isUTC)
             useUTC();
         const Report report = reportOf(*options);
-        // Another form of the report, such as a page in a file, is written here in place of the text.
-        fmt::print("{}", textOf(report, *options));
+        if (options->page.empty())
+            fmt::print("{}", textOf(report, *options));
+        else
+            writePage(report, *options);
         exitStatus = exitOk;
     });
 }

@@ -1,0 +1,47 @@
+// The sections of the page, one function and one file each. Each has a heading, a picture, and its figures as a table.
+#pragma once
+
+#include "kesto/report/Report.h"
+
+#include <string>
+#include <string_view>
+#include <vector>
+
+struct PageWords {
+    bool isUTC = false; // moments are in UTC, else in the time zone of the process
+    bool hasNotes = true; // what a pointer shows at a mark
+    bool isRecording = false;
+
+    [[nodiscard]] std::string_view played() const { return isRecording ? "recorded" : "played"; }
+    [[nodiscard]] std::string_view playing() const { return isRecording ? "recording" : "playing"; }
+};
+
+[[nodiscard]] std::string timeSection(const Report& report, const PageWords& words);
+[[nodiscard]] std::string deviceSection(const Report& report, const PageWords& words);
+[[nodiscard]] std::string volumeSection(const Report& report, const PageWords& words);
+[[nodiscard]] std::string faultSection(const Report& report, const PageWords& words);
+[[nodiscard]] std::string worstSection(const Report& report, const PageWords& words);
+
+// A table behind a picture, closed until somebody opens it. The first column of each row is its heading. All is HTML.
+struct PageTable {
+    std::string summary;
+    std::vector<std::string> head;
+    std::vector<std::vector<std::string>> rows;
+};
+[[nodiscard]] std::string tableHTML(const PageTable& table);
+
+// Marks of an axis from 0 up: a round step, so that at most five lie above 0 and the last is not below the largest.
+struct AxisSteps {
+    double step = 1;
+    int count = 1;
+
+    [[nodiscard]] double top() const { return step * count; }
+};
+[[nodiscard]] AxisSteps stepsUpTo(double largest);
+
+// The unit in which an axis of time is readable.
+struct TimeUnit {
+    std::string_view name; // "hours"
+    double seconds = 1;
+};
+[[nodiscard]] TimeUnit unitFor(double largestSeconds);
