@@ -18,10 +18,10 @@
 
 #include "ledger/Workload.h"
 #include "platform/LogShare.h"
-#include "platform/Submitter.h"
 #include "platform/Turn.h"
 
 #include <chrono>
+#include <compare>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -48,6 +48,14 @@ public:
     virtual void submit(WorkItem item) = 0;
     // Whether the calling thread is running an item of this queue.
     [[nodiscard]] virtual bool isCurrent() const = 0;
+};
+
+// Who submits to a lane: a process of a user, as the kernel tells.
+struct Submitter {
+    std::uint32_t user = 0;
+    std::int32_t process = 0; // 0 where the kernel does not tell
+
+    friend auto operator<=>(const Submitter&, const Submitter&) = default;
 };
 
 class Lane;

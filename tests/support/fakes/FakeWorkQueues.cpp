@@ -55,7 +55,10 @@ public:
     {
         queues_.items_.push_back({queue_, shared_from_this(), std::move(item)});
     }
-    [[nodiscard]] std::shared_ptr<Lane> makeLane(const platform::Submitter& submitter) override { return queue_->makeLane(submitter); }
+    [[nodiscard]] std::shared_ptr<Lane> makeLane(const platform::Submitter& submitter) override
+    {
+        return queue_->makeLane(submitter);
+    }
     [[nodiscard]] bool isCurrent() const override { return queue_->isCurrent(); }
     [[nodiscard]] bool isFull(std::size_t heldBytes) override
     {

@@ -7,7 +7,7 @@
 // costs none.
 #pragma once
 
-#include "platform/Submitter.h"
+#include "platform/WorkQueue.h"
 
 #include <chrono>
 #include <cstddef>
