@@ -21,7 +21,6 @@
 #include "platform/Turn.h"
 
 #include <chrono>
-#include <compare>
 #include <cstddef>
 #include <cstdint>
 #include <functional>
@@ -54,8 +53,6 @@ public:
 struct Submitter {
     std::uint32_t user = 0;
     std::int32_t process = 0; // 0 where the kernel does not tell
-
-    friend auto operator<=>(const Submitter&, const Submitter&) = default;
 };
 
 class Lane;
