@@ -2,9 +2,11 @@
 // does not notice, and of a large one the sessions lie beside each other.
 #include "kesto/history/History.h"
 
+#include "foundation/values/String.h"
 #include "kesto/history/HistoryQueries.h"
 #include "kesto/store/EventDatabase.h"
 #include "kesto/store/StoreHolder.h"
+#include "platform/PlayingFacts.h"
 #include "platform/linux/store/stretches/Stretch.h"
 
 #include <algorithm>
@@ -76,17 +78,22 @@ private:
                                               database_.path().native()));
     }
 
+    // `row`: session, recording, and so on. A session that did it outside of the span, too, says of a fault what it
+    // did.
+    [[nodiscard]] bool isAskedFor(const SqliteStatement& row)
+    {
+        const std::int64_t session = row.integer(0);
+        const bool isIt = (row.integer(1) != 0) == question_.isRecording;
+        auto& sessions = isIt ? sessions_ : otherSessions_;
+        if (sessions.empty() || sessions.back() != session)
+            sessions.push_back(session);
+        return isIt;
+    }
+
     // `row`: session, recording, began, device, format, volume. The ending is that of the store; of what runs, empty.
     void add(const SqliteStatement& row, double seconds, std::string_view ending)
     {
-        const std::int64_t session = row.integer(0);
-        const bool isAskedFor = (row.integer(1) != 0) == question_.isRecording;
-        auto& sessions = isAskedFor ? sessions_ : otherSessions_;
-        if (sessions.empty() || sessions.back() != session)
-            sessions.push_back(session);
-        if (!isAskedFor)
-            return;
-        history_.stretches.push_back({.session = session,
+        history_.stretches.push_back({.session = row.integer(0),
                                       .began = row.real(2),
                                       .seconds = seconds,
                                       .device = std::string(row.text(3)),
@@ -109,11 +116,15 @@ private:
     {
         const auto statement = database_.prepare(history_queries::stretches);
         bindSpan(statement);
-        database_.forEachRow(statement, [this](const SqliteStatement& row) { add(row, row.real(6), row.text(7)); });
+        database_.forEachRow(statement, [this](const SqliteStatement& row) {
+            const bool isInSpan = row.integer(8) != 0;
+            if (isAskedFor(row) && isInSpan)
+                add(row, row.real(6), row.text(7));
+        });
     }
 
     // As the service ends them at its next start, if it was killed: they ran until its last transaction. Two clocks
-    // cannot be compared, so the length is between two times of the service's own.
+    // cannot be compared, so they begin by the service's clock, too.
     void readOpenStretches(bool isRunning)
     {
         const auto lastWord = database_.prepare(history_queries::lastWord);
@@ -123,8 +134,9 @@ private:
         const auto statement = database_.prepare(history_queries::openStretches);
         database_.forEachRow(statement, [this, isRunning](const SqliteStatement& row) {
             const double began = row.real(2);
-            const double seconds = platform::lengthOfTime(row.real(6), history_.now);
-            if (began < question_.span.until && began + seconds > question_.span.from && (isRunning || seconds > 0))
+            const double seconds = platform::lengthOfTime(began, history_.now);
+            const bool isInSpan = began < question_.span.until && began + seconds > question_.span.from;
+            if (isAskedFor(row) && isInSpan && (isRunning || seconds > 0))
                 add(row, seconds, isRunning ? "" : serviceEnded);
         });
     }
@@ -138,7 +150,8 @@ private:
             history_.faults.push_back({.session = row.integer(0),
                                        .happened = row.real(1),
                                        .kind = std::string(row.text(2).substr(history_queries::faultPrefix.size())),
-                                       .device = std::string(row.text(3)),
+                                       .device = std::string(foundation::cutBetweenCharacters(
+                                           row.text(3), platform::PlayingFacts::longestDevices)), // as of a stretch
                                        .lateCycles = std::clamp<std::int64_t>(row.integer(4), 0, most)});
         });
         std::ranges::stable_sort(history_.faults, {}, &Fault::happened);

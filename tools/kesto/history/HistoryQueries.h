@@ -7,12 +7,11 @@ namespace history_queries {
 
 constexpr std::string_view tableCount = "SELECT count(*) FROM sqlite_schema WHERE type = 'table' AND name IN"
                                         " ('stretches', 'open_stretches', 'sessions', 'sources', 'store')";
-constexpr std::string_view stretches =
-    "SELECT session, recording, began, device, format, volume, seconds, ending FROM stretches"
-    " WHERE began < ?1 AND began + seconds > ?2";
+constexpr std::string_view stretches = "SELECT session, recording, began, device, format, volume, seconds, ending,"
+                                       " began < ?1 AND began + seconds > ?2 FROM stretches";
 constexpr std::string_view lastWord = "SELECT wall_time FROM store WHERE wall_time IS NOT NULL";
 constexpr std::string_view openStretches =
-    "SELECT session, recording, began, device, format, volume, arrived FROM open_stretches ORDER BY id";
+    "SELECT session, recording, arrived, device, format, volume FROM open_stretches ORDER BY id";
 // An event of the category Error stands in the store under two names: by this one each counts once. SQLite finds it by
 // the index of names, because the pattern is a literal.
 constexpr std::string_view faultPrefix = "com.quarn.kesto.Error.";

@@ -198,11 +198,16 @@ private:
              {&all_, &applications_[application], &devices_[device], &formats_[formats_.of(stretch.format)]})
             sum->add(piece);
         report_.running += stretch.isRunning && running_.meets(stretch.session) ? 1 : 0;
-        const bool hasVanished = stretch.hasVanished && stretch.began + stretch.seconds <= report_.span.until;
-        report_.vanished += hasVanished && vanished_.meets(stretch.session) ? 1 : 0;
+        report_.vanished += hasVanished(stretch) && vanished_.meets(stretch.session) ? 1 : 0;
         if (piece.volume && *piece.volume > 0)
             report_.secondsAtVolume[stepOf(*piece.volume)] += piece.until - piece.from;
         pieces_.push_back({piece, application, device});
+    }
+
+    // In the span.
+    [[nodiscard]] bool hasVanished(const PlayedStretch& stretch) const
+    {
+        return stretch.hasVanished && stretch.began + stretch.seconds <= report_.span.until;
     }
 
     static Index stepOf(double volume)
@@ -310,7 +315,7 @@ private:
         return false;
     }
 
-    // The faults are sorted by session.
+    // The faults are sorted by session, and so are the pieces.
     void findWorst()
     {
         struct OfSession {
@@ -328,12 +333,21 @@ private:
             ++sessions.back().faults;
         }
         report_.withFaults = sessions.size();
+        report_.faultless = report_.all.sessions
+            - static_cast<std::size_t>(std::ranges::count_if(
+                sessions, [this](std::int64_t session) { return hasPlayed(session); }, &OfSession::session));
         std::ranges::stable_sort(sessions, [](const OfSession& one, const OfSession& other) {
             return std::tie(one.lateCycles, one.faults) > std::tie(other.lateCycles, other.faults);
         });
         sessions.resize(std::min(sessions.size(), Report::mostWorst));
         for (const OfSession& each : sessions)
             report_.worst.push_back(worstSession(each.session, each.lateCycles));
+    }
+
+    [[nodiscard]] bool hasPlayed(std::int64_t session) const
+    {
+        return std::ranges::binary_search(pieces_, session, {},
+                                          [](const CountedPiece& each) { return each.piece.session; });
     }
 
     [[nodiscard]] WorstSession worstSession(std::int64_t id, std::int64_t lateCycles) const
@@ -354,7 +368,7 @@ private:
             devices[stretch.device] += piece->until - piece->from;
             worst.stretches.push_back(stretch);
             worst.isRunning |= stretch.isRunning;
-            worst.hasVanished |= stretch.hasVanished;
+            worst.hasVanished |= hasVanished(stretch);
         }
         for (const CountedFault& each :
              std::ranges::equal_range(faults_, id, {}, [](const CountedFault& each) { return each.fault->session; }))

@@ -66,7 +66,8 @@ struct Report {
     Played all;
     std::size_t running = 0; // sessions
     std::size_t vanished = 0; // sessions
-    std::size_t withFaults = 0; // sessions
+    std::size_t withFaults = 0; // sessions, also those that played nothing in the span
+    std::size_t faultless = 0; // sessions that played, without a fault
     bool isOverlapping = false; // two streams at once played somewhere in it
     std::vector<ReportDay> days; // every day of the span, also those without sound
     std::vector<ReportLine> applications; // those with the most time first, as in the next two

@@ -10,7 +10,6 @@
 #include "kesto/report/ReportText.h"
 #include "kesto/report/page/ReportPage.h"
 #include "kesto/results/MomentText.h"
-#include "platform/linux/process/Environment.h"
 
 #include <algorithm>
 #include <array>
@@ -22,6 +21,7 @@
 #include <ctime>
 #include <fmt/format.h>
 #include <memory>
+#include <optional>
 #include <string>
 #include <unistd.h>
 #include <vector>
@@ -34,14 +34,14 @@ using std::chrono::sys_days;
 struct ReportOptions {
     std::filesystem::path database;
     HistoryQuestion question;
-    std::string since;
-    std::string until;
-    std::string dayStarts;
+    std::optional<std::string> since;
+    std::optional<std::string> until;
+    std::optional<std::string> dayStarts;
     std::string by;
     bool isUTC = false;
     bool isCsv = false;
     bool isJson = false;
-    std::string page; // the path of the file; "-": standard output
+    std::optional<std::string> page; // the path of the file; "-": standard output
 };
 
 // The last day of the report and the six before it are a week.
@@ -91,19 +91,18 @@ void useUTC()
 Report reportOf(ReportOptions& options)
 {
     DayStart dayStart{.afterMidnight = {}, .isUTC = options.isUTC};
-    if (!options.dayStarts.empty())
-        dayStart.afterMidnight = dayStartOf(options.dayStarts);
+    if (options.dayStarts)
+        dayStart.afterMidnight = dayStartOf(*options.dayStarts);
     TimeSpan& span = options.question.span;
-    if (!options.until.empty())
-        span.until = momentOf("--until", options.until);
+    if (options.until)
+        span.until = momentOf("--until", *options.until);
     const double ends = std::min(span.until, present());
     const sys_days last(dayOf(std::nextafter(ends, 0), dayStart)); // an end at midnight is that of the day before
-    span.from = options.since.empty() ? beginningOf(last - daysBefore, dayStart) : momentOf("--since", options.since);
-    if (span.from >= ends)
-        throw CLI::ValidationError("--since", "the report would end before it begins");
+    span.from = options.since ? momentOf("--since", *options.since) : beginningOf(last - daysBefore, dayStart);
+    if (std::max(span.from, calendarSpan.from) >= ends)
+        throw CLI::ValidationError(options.since ? "--since" : "--until", "the report would end before it begins");
     const History history = readHistory(options.database, options.question);
-    if (options.until.empty())
-        span.until = present();
+    span.until = std::min(span.until, present()); // what runs counts up to now
     return makeReport(history, span, options.question.isRecording, dayStart);
 }
 
@@ -134,12 +133,13 @@ std::string timeZoneName(bool isUTC)
 {
     if (isUTC)
         return "UTC";
-    std::string name = platform::environment("TZ");
+    std::error_code missing;
+    const char* const zone = std::getenv("TZ");
+    std::string name = zone == nullptr ? std::filesystem::read_symlink("/etc/localtime", missing).string() : zone;
+    if (zone != nullptr && name.empty()) // as the C library has it
+        return "UTC";
     if (name.starts_with(':'))
         name.erase(0, 1);
-    std::error_code missing;
-    if (name.empty())
-        name = std::filesystem::read_symlink("/etc/localtime", missing);
     constexpr std::string_view folder = "zoneinfo/";
     if (const auto place = name.rfind(folder); place != std::string::npos)
         name.erase(0, place + folder.size());
@@ -154,12 +154,12 @@ void writePage(const Report& report, const ReportOptions& options)
                     .database = options.database,
                     .made = present(),
                     .timeZone = timeZoneName(options.isUTC)
-                        + (options.dayStarts.empty() ? std::string() : ", each from " + options.dayStarts),
+                        + (options.dayStarts ? ", each from " + *options.dayStarts : std::string()),
                     .isUTC = options.isUTC});
-    if (options.page == "-")
+    if (*options.page == "-")
         fmt::print("{}", page);
     else
-        writeWholeOutput(options.page, page);
+        writeWholeOutput(*options.page, page);
 }
 
 std::vector<std::string> tableNames()
@@ -206,10 +206,10 @@ void addReportCommand(CLI::App& application, int& exitStatus)
         if (options->isUTC)
             useUTC();
         const Report report = reportOf(*options);
-        if (options->page.empty())
-            fmt::print("{}", textOf(report, *options));
-        else
+        if (options->page)
             writePage(report, *options);
+        else
+            fmt::print("{}", textOf(report, *options));
         exitStatus = exitOk;
     });
 }

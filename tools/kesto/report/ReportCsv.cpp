@@ -1,4 +1,5 @@
-// Names are those of clients: what would move a terminal's cursor is replaced, and what would divide a row is quoted.
+// Names are those of clients: what would move a terminal's cursor is replaced, what would divide a row is quoted, and
+// what a spreadsheet would take for a formula becomes a text.
 #include "kesto/report/ReportCsv.h"
 
 #include "kesto/Terminal.h"
@@ -8,7 +9,10 @@
 
 std::string csvField(std::string_view text)
 {
+    constexpr std::string_view beginningsOfFormulas = "=+-@";
     std::string shown = printable(text);
+    if (beginningsOfFormulas.contains(shown.empty() ? ' ' : shown.front()))
+        shown.insert(0, 1, '\'');
     if (shown.find_first_of(",\"") == std::string::npos)
         return shown;
     std::string quoted = "\"";

@@ -8,5 +8,6 @@
 
 // docs/report.md describes the columns.
 [[nodiscard]] std::string reportCsv(const Report& report, ReportBy by);
-// A name of clients as a field: what would move a terminal's cursor is replaced, what would divide a row is quoted.
+// A name of clients as a field: what would move a terminal's cursor is replaced, what would divide a row is quoted, and
+// what a spreadsheet would take for a formula begins with an apostrophe.
 [[nodiscard]] std::string csvField(std::string_view text);

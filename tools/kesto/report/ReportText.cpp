@@ -281,5 +281,6 @@ private:
 
 std::string reportText(const Report& report, const std::vector<ReportBy>& tables, const ReportLayout& layout)
 {
-    return ReportPrinter(report, layout).print(tables);
+    const std::string text = ReportPrinter(report, layout).print(tables);
+    return layout.isUTF8 ? text : asciiText(text);
 }

@@ -14,8 +14,8 @@ namespace fs = std::filesystem;
 
 void EventStore::forEach(const EventFilter& filter, const std::function<void(const StoredEvent&)>& visit)
 {
-    // With a second pattern SQLite does not use its index of names, so it is there only where it can match.
-    const bool isShort = filter.namePattern.find_first_of("*?[") != 0 && !filter.namePattern.starts_with(namePrefix);
+    // With a second pattern SQLite does not use its index of names, so it is there only where it can match more.
+    const bool isShort = !filter.namePattern.starts_with('*') && !filter.namePattern.starts_with(namePrefix);
     const std::string shortPattern = std::string(namePrefix) + filter.namePattern;
     const auto statement =
         database_.prepare(fmt::format("SELECT id, time, name, payload FROM ("

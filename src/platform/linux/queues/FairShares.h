@@ -4,7 +4,7 @@
 // among the user's processes the one that took the least, and among the process's shares again: start-time fair
 // queueing (P. Goyal, H. M. Vin, H. Cheng, 1996) at three levels. So a process gains nothing by many connections. Who
 // wanted nothing for a while goes on where the others are now: a pause earns no time to be used at once later, and
-// costs none.
+// costs none. A user who starts one process after the other may hold up the user's other processes, and nobody else's.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -32,7 +32,7 @@ public:
     struct Node {
         std::shared_ptr<Node> group; // that it takes part in; null: it is the root
         Duration used{};
-        Duration now{}; // what the one in it that was served last had used before
+        Duration now{}; // what the one in it that was served last had used before; when nobody waits, what it used
         Contest contest; // empty in a share
     };
     // What takes part derives from this, and leaves it to this class.

@@ -171,8 +171,8 @@ SqliteEventFile::Expected<> SqliteEventFile::closeEarlierRun(std::optional<doubl
         const auto unfinished = stretchRows_.unfinished();
         if (!unfinished)
             return std::unexpected(unfinished.error());
-        for (auto [owner, stretch, arrived] : *unfinished) {
-            stretch.seconds = lengthOfTime(arrived, *end);
+        for (auto [owner, stretch] : *unfinished) {
+            stretch.seconds = lengthOfTime(stretch.began, *end);
             ++(stretch.seconds > 0 ? stretchCounts_.closed : stretchCounts_.leftOut);
             if (const auto done = stretch.seconds > 0 ? insertStretch(owner, stretch) : Expected<>(); !done)
                 return done;

@@ -123,6 +123,22 @@ TEST_F(HistoryOfStore, TellsPlayingFromRecording)
     EXPECT_THAT(faultsOf(read({.isRecording = true})), ElementsAre("2 205 IssueDetector microphone 0"));
 }
 
+TEST_F(HistoryOfStore, TellsItAlsoByWhatASessionDidOutsideOfTheSpan)
+{
+    store.add({.session = 2, .began = 100, .seconds = 10, .device = "microphone", .isRecording = true});
+    store.addFault(2, 205, R"({"active_devices":"microphone"})");
+    EXPECT_THAT(faultsOf(read({.span = {.from = 200}})), IsEmpty());
+    EXPECT_THAT(faultsOf(read({.span = {.from = 200}, .isRecording = true})),
+                ElementsAre("2 205 IssueDetector microphone 0"));
+    EXPECT_THAT(linesOf(read({.span = {.from = 200}, .isRecording = true})), IsEmpty());
+}
+
+TEST_F(HistoryOfStore, CutsTheDeviceOfAFaultAsThatOfAStretch)
+{
+    store.addFault(1, 5, R"({"active_devices":")" + std::string(300, 'x') + "\"}");
+    EXPECT_THAT(faultsOf(read()), ElementsAre("1 5 IssueDetector " + std::string(256, 'x') + " 0"));
+}
+
 TEST_F(HistoryOfStore, HasAVolumeFromNoneToAll)
 {
     store.add({.began = 1, .seconds = 1, .volume = -3});
@@ -242,9 +258,9 @@ protected:
 
 TEST_F(HistoryOfRunningSessions, EndsWithTheLastWordOfAKilledService)
 {
-    EXPECT_THAT(linesOf(read()), ElementsAre("1 999+200 speaker S16LE/48000/2 0.25 cut off"));
+    EXPECT_THAT(linesOf(read()), ElementsAre("1 1000+200 speaker S16LE/48000/2 0.25 cut off"));
     EXPECT_EQ(read().now, 1200);
-    EXPECT_THAT(linesOf(read({.span = {.from = 1199}})), IsEmpty());
+    EXPECT_THAT(linesOf(read({.span = {.from = 1200}})), IsEmpty());
     EXPECT_THAT(linesOf(read({.span = {.until = 999}})), IsEmpty());
 }
 
@@ -282,6 +298,18 @@ TEST_F(HistoryOfRunningSessions, HasOneThatHasJustBegun)
     ASSERT_EQ(history.stretches.size(), 1U);
     EXPECT_EQ(history.stretches[0].seconds, 0) << "a clock that was set back";
     EXPECT_TRUE(history.stretches[0].isRunning);
+}
+
+TEST_F(HistoryOfRunningSessions, CountsOneWhoseClientsClockIsAheadFromItsArrival)
+{
+    hold();
+    ASSERT_EQ(::flock(held.get(), LOCK_EX | LOCK_NB), 0);
+    store.execute("DELETE FROM open_stretches");
+    store.addOpen({.session = 1, .began = present() + 3600}, present() - 30);
+    const History history = read();
+    ASSERT_EQ(history.stretches.size(), 1U);
+    EXPECT_GE(history.stretches[0].seconds, 30);
+    EXPECT_DOUBLE_EQ(history.stretches[0].began + history.stretches[0].seconds, history.now);
 }
 
 // --- Other stores

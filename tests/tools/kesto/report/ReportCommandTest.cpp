@@ -139,14 +139,31 @@ TEST_F(ReportCommand, RefusesWhatItCannotUnderstand)
         EXPECT_THAT(finished.errors, HasSubstr(reason));
     };
     for (const char* const time : {"24:00", "4", "4:", "04:60", "04:00x", "-1:00", ""})
-        if (*time != '\0')
-            expectUsage({"report", "--day-starts", time}, "is not a time of day: write HH:MM, such as 04:00");
+        expectUsage({"report", "--day-starts", time}, "is not a time of day: write HH:MM, such as 04:00");
+    expectUsage({"report", "--since", ""}, "\"\" is not a time");
+    expectUsage({"report", "--until", ""}, "\"\" is not a time");
+    expectUsage({"report", "--until", "1950-01-01"}, "--until: the report would end before it begins");
+    expectUsage({"report", "--since", "1950-01-01", "--until", "1960-01-01"}, "the report would end before it begins");
     expectUsage({"report", "--since", "soon"}, "\"soon\" is not a time");
     expectUsage({"report", "--until", "soon"}, "\"soon\" is not a time");
     expectUsage({"report", "--since", "1h", "--until", "2h"}, "the report would end before it begins");
     expectUsage({"report", "--since", "9999-01-01"}, "the report would end before it begins");
     expectUsage({"report", "--by", "moon"}, "moon");
     expectUsage({"report", "--csv", "--json"}, "excludes");
+}
+
+TEST_F(ReportCommand, HasNoDayToCome)
+{
+    const std::string csv = tool.print({"report", "--csv", "--until", "2100-01-01"});
+    EXPECT_EQ(std::ranges::count(csv, '\n'), 8) << csv;
+}
+
+TEST_F(ReportCommand, WritesAsciiWhereTheLocaleDoes)
+{
+    store.addSession(1, "K\u00fcche", sunday);
+    store.add({.session = 1, .began = sunday, .seconds = 7200});
+    tool.setVariable("LC_ALL=C");
+    EXPECT_THAT(print({"--by", "application"}), HasSubstr("\nK?che "));
 }
 
 TEST_F(ReportCommand, SurvivesSpansThatNoCalendarHas)

@@ -128,7 +128,7 @@ TEST(ReportAsText, MakesRoomForLongFigures)
     EXPECT_EQ(reportText(reportForForms(history), {ReportBy::Application}, {.width = 60, .isUTF8 = false}),
               "1 min played in 1 session; 100000 faults, 6000000.00 an hour\n"
               "APPLICATION        PLAYED  SHARE  VOLUME  FAULTS       /HOUR\n"
-              "org.example.pla…    1 min  100 %    38 %  100000  6000000.00\n");
+              "org.example.pla~    1 min  100 %    38 %  100000  6000000.00\n");
 }
 
 TEST(ReportAsText, HasShortTimesInShortUnits)
@@ -260,6 +260,14 @@ TEST(ReportAsCsv, QuotesQuotes)
               "device,seconds,sessions,faults,mean_volume\n"
               "\"the \"\"left\"\" one\",28800.0,1,0,0.375\n"
               "speaker,0.0,0,2,\n");
+}
+
+TEST(ReportAsCsv, HasNoFormulaForASpreadsheet)
+{
+    for (const std::string_view name : {"=cmd|calc", "+x", "-dev", "@SUM(1)"})
+        EXPECT_EQ(csvField(name), "'" + std::string(name));
+    EXPECT_EQ(csvField("a=b"), "a=b");
+    EXPECT_EQ(csvField(""), "");
 }
 
 TEST(DecimalText, HasAPointAndNoIdleZeros)

@@ -189,6 +189,7 @@ TEST(ReportOfHistory, KeepsFaultsOfSessionsWithoutPlayingTime)
     EXPECT_EQ(report.all.faultsAnHour(), std::nullopt);
     EXPECT_THAT(textOf(report.applications), ElementsAre(" 0 0 2"));
     EXPECT_EQ(report.withFaults, 1U) << "nobody knows whose the other is";
+    EXPECT_EQ(report.faultless, 0U);
     ASSERT_THAT(report.worst, SizeIs(1));
     EXPECT_EQ(report.worst[0].session.id, 7);
 }
@@ -249,6 +250,26 @@ TEST(ReportOfHistory, NamesTheWorstSessions)
     EXPECT_EQ(report.worst[1].session.id, 12);
     EXPECT_EQ(report.worst[9].session.id, 4);
     EXPECT_EQ(report.withFaults, 13U);
+}
+
+TEST(ReportOfHistory, CountsSessionsWithoutAFaultAmongThoseThatPlayed)
+{
+    const Report report = reportOf(
+        historyOf({stretch(1, 0, 10), stretch(2, 0, 10), stretch(3, 0, 10)}, {fault(2, 5), fault(2, 6), fault(4, 7)}));
+    EXPECT_EQ(report.withFaults, 2U);
+    EXPECT_EQ(report.faultless, 2U);
+}
+
+TEST(ReportOfHistory, HasNoneVanishedAfterItsEnd)
+{
+    std::vector<PlayedStretch> stretches{stretch(1, 0, 100), stretch(2, 0, 20)};
+    for (PlayedStretch& each : stretches)
+        each.hasVanished = true;
+    const Report report = reportOf(historyOf(stretches, {fault(1, 5), fault(2, 5)}), {.from = 0, .until = 50});
+    EXPECT_EQ(report.vanished, 1U);
+    ASSERT_THAT(report.worst, SizeIs(2));
+    EXPECT_FALSE(report.worst[0].hasVanished);
+    EXPECT_TRUE(report.worst[1].hasVanished);
 }
 
 TEST(ReportOfHistory, EndsWhatHasNoEnd)

@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <limits>
+#include <ranges>
 #include <utility>
 
 namespace platform {
@@ -77,15 +78,24 @@ bool merge(PlayingState& state, const PlayingFacts& facts)
     return differs;
 }
 
-// Two clocks cannot be compared: only where both messages say when they happened, these times count. What was counted
-// before, up to the earlier end, is cut off; stamps that all lie before it are those of another clock.
-std::pair<double, double> lengthOf(const StretchMoment& began, const StretchMoment& ended,
+// When it began, by the client's clock: what was counted is cut off. A clock that was set back began before all of
+// that.
+std::optional<double> beginning(const StretchMoment& began, const std::optional<CountedTime>& counted)
+{
+    if (!began.happened || !counted || *began.happened < counted->from)
+        return began.happened;
+    return std::max(*began.happened, counted->until);
+}
+
+// Two clocks cannot be compared: only where both messages say when they happened, these times count. What an earlier
+// run has counted is cut off; stamps that all lie before its end are those of another clock.
+std::pair<double, double> lengthOf(std::optional<double> beganHappened, double beganArrived, const StretchMoment& ended,
                                    std::optional<double> earlierEnd)
 {
-    if (!began.happened || !ended.happened)
-        return {began.time(), lengthOfTime(began.arrived, ended.arrived)};
-    const bool isCountedInPart = earlierEnd && *began.happened < *earlierEnd && *earlierEnd < *ended.happened;
-    const double from = isCountedInPart ? *earlierEnd : *began.happened;
+    if (!beganHappened || !ended.happened)
+        return {beganArrived, lengthOfTime(beganArrived, ended.arrived)};
+    const bool isCountedInPart = earlierEnd && *beganHappened < *earlierEnd && *earlierEnd < *ended.happened;
+    const double from = isCountedInPart ? *earlierEnd : *beganHappened;
     return {from, lengthOfTime(from, *ended.happened)};
 }
 
@@ -159,7 +169,13 @@ void Stretches::end(std::uint64_t number, Session& session, std::size_t directio
 {
     const OpenStretch open = *std::exchange(session.open[direction], std::nullopt);
     changed_.push_back(keyOf(number, direction));
-    const auto [began, seconds] = lengthOf(open.began, when, std::max(earlierEnd_, session.brokenOff));
+    const auto& counted = session.counted[direction];
+    const auto happened = beginning(open.began, counted);
+    const auto [began, seconds] = lengthOf(happened, open.began.arrived, when, earlierEnd_);
+    if (ending == StretchEnding::Vanished && happened) {
+        const bool goesOn = *happened > *open.began.happened;
+        rememberBrokenOff({session.owner, direction, {goesOn ? counted->from : *happened, *happened + seconds}});
+    }
     if (seconds > 0)
         ended_.push_back({open.origin, direction == recording, began, seconds, session.state, ending});
     else
@@ -169,12 +185,8 @@ void Stretches::end(std::uint64_t number, Session& session, std::size_t directio
 void Stretches::end(std::uint64_t session, double time, StretchEnding ending)
 {
     Session* const found = find(session);
-    if (found == nullptr)
-        return;
-    if (ending == StretchEnding::Vanished && (found->open[playing] || found->open[recording]))
-        rememberBrokenOff(found->owner, time);
     for (const std::size_t direction : directions)
-        if (found->open[direction])
+        if (found != nullptr && found->open[direction])
             end(session, *found, direction, {.arrived = time, .happened = {}}, ending);
 }
 
@@ -201,21 +213,24 @@ Stretches::Session* Stretches::sessionOf(std::uint64_t number, const OwnerOf& ow
         return nullptr;
     Session& session = sessions_[number];
     session.owner = *owner;
-    session.brokenOff = lastBrokenOff(*owner);
+    for (const std::size_t direction : directions)
+        session.counted[direction] = lastBrokenOff(*owner, direction);
     return &session;
 }
 
-void Stretches::rememberBrokenOff(const SessionOwner& owner, double time)
+void Stretches::rememberBrokenOff(const BrokenOff& brokenOff)
 {
-    brokenOff_.push_back({owner, time});
+    brokenOff_.push_back(brokenOff);
     if (brokenOff_.size() > mostBrokenOff)
         brokenOff_.pop_front();
 }
 
-std::optional<double> Stretches::lastBrokenOff(const SessionOwner& owner) const
+std::optional<CountedTime> Stretches::lastBrokenOff(const SessionOwner& owner, std::size_t direction) const
 {
-    const auto last = std::ranges::find(brokenOff_.rbegin(), brokenOff_.rend(), owner, &BrokenOff::owner);
-    return last == brokenOff_.rend() ? std::nullopt : std::optional(last->time);
+    for (const BrokenOff& each : brokenOff_ | std::views::reverse)
+        if (each.owner == owner && each.direction == direction)
+            return each.counted;
+    return std::nullopt;
 }
 
 // --- Writing them

@@ -24,12 +24,18 @@
 
 namespace platform {
 
+// What was counted of a client until its connection broke, by the client's own clock.
+struct CountedTime {
+    double from = 0;
+    double until = 0;
+};
+
 // One thread at a time.
 class Stretches {
 public:
     // So many may wait for a database that cannot be written to.
     static constexpr std::size_t mostWaiting = 1024;
-    // So many sessions whose connection broke are remembered, the last ones.
+    // So many that ended with their connection are remembered, the last ones.
     static constexpr std::size_t mostBrokenOff = 1024;
 
     // The owner of a session, as before the ends that the batch announces; nothing if the session does not live.
@@ -75,11 +81,12 @@ private:
         PlayingState state;
         std::array<std::optional<OpenStretch>, 2> open; // playing, recording: all in that state
         SessionOwner owner;
-        std::optional<double> brokenOff; // until then an earlier session of the owner is counted
+        std::array<std::optional<CountedTime>, 2> counted; // of an earlier session of the owner
     };
     struct BrokenOff {
         SessionOwner owner;
-        double time;
+        std::size_t direction;
+        CountedTime counted;
     };
     using Sessions = std::unordered_map<std::uint64_t, Session>;
 
@@ -90,8 +97,8 @@ private:
     void begin(std::uint64_t number, Session& session, std::size_t direction, const OpenStretch& open);
     [[nodiscard]] Session* sessionOf(std::uint64_t number, const OwnerOf& ownerOf);
     [[nodiscard]] Session* find(std::uint64_t number);
-    void rememberBrokenOff(const SessionOwner& owner, double time);
-    [[nodiscard]] std::optional<double> lastBrokenOff(const SessionOwner& owner) const;
+    void rememberBrokenOff(const BrokenOff& brokenOff);
+    [[nodiscard]] std::optional<CountedTime> lastBrokenOff(const SessionOwner& owner, std::size_t direction) const;
     void sortChanged();
 
     Sessions sessions_;

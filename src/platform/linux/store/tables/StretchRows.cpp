@@ -44,7 +44,7 @@ StoreExpected<StretchRows> StretchRows::open(SqliteConnection& connection)
          " channels, volume) VALUES (?, ?, ?, ?, ?, ?, ?, ?, ?, ?)"},
         {&rows.removeOpen_, "DELETE FROM open_stretches WHERE id = ?"},
         {&rows.selectOpen_,
-         "SELECT holder, session, recording, began, arrived, device, format, channels, volume FROM open_stretches"
+         "SELECT holder, session, recording, arrived, device, format, channels, volume FROM open_stretches"
          " ORDER BY id"},
         {&rows.forgetOpen_, "DELETE FROM open_stretches"},
         {&rows.areBelow_, "SELECT 1 FROM stretches WHERE id < ? LIMIT 1"},
@@ -110,9 +110,8 @@ StoreExpected<std::vector<StretchRows::Unfinished>> StretchRows::unfinished() co
                                      .isRecording = selectOpen_.integer(2) != 0,
                                      .began = selectOpen_.real(3),
                                      .seconds = 0,
-                                     .state = readState(selectOpen_, 5),
-                                     .ending = StretchEnding::ServiceEnded},
-                         .arrived = selectOpen_.real(4)});
+                                     .state = readState(selectOpen_, 4),
+                                     .ending = StretchEnding::ServiceEnded}});
         if (!selectOpen_.isNull(1))
             found.back().owner.session = selectOpen_.integer(1);
     }

@@ -25,8 +25,7 @@ public:
     // One that ran when the service was killed.
     struct Unfinished {
         Owner owner;
-        Stretch stretch; // without its length
-        double arrived = 0; // its beginning by the service's clock
+        Stretch stretch; // without its length; it began by the service's clock
     };
     struct Range { // of IDs
         std::int64_t from = 0;

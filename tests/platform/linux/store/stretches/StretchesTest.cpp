@@ -252,7 +252,7 @@ TEST_F(StretchesTest, AStampOnOneSideOnlyLeavesTheLengthToTheTimesOfArrival)
     takeBatch();
     ASSERT_EQ(stretches.ended().size(), 1U);
     EXPECT_EQ(stretches.ended()[0].seconds, 3.0);
-    EXPECT_EQ(stretches.ended()[0].began, 5.0);
+    EXPECT_EQ(stretches.ended()[0].began, began + 1);
 }
 
 TEST_F(StretchesTest, StampsOfAnotherClockCountAmongEachOther)
@@ -311,12 +311,19 @@ protected:
     }
     std::vector<std::string> continued(const SessionOwner& owner, double since = 4, double until = 15)
     {
-        constexpr Origin next{.source = 2, .session = 8};
         owners[8] = owner;
-        add(since, "Playback.Start", {}, true, next);
+        goOn(12, since, next);
         add(until, "Playback.Stop", {}, true, next);
         return ended();
     }
+    // A Start that arrives so late, and says since when.
+    void goOn(double arrives, double since, Origin origin)
+    {
+        batch.add(began + arrives, origin, "com.quarn.kesto.Playback.Start",
+                  {{"kestoreporting_timestamp", began + since}});
+    }
+
+    static constexpr Origin next{.source = 2, .session = 8};
 };
 
 TEST_F(StretchesContinuedTest, CountsFromWhereItsConnectionBroke)
@@ -331,9 +338,74 @@ TEST_F(StretchesContinuedTest, CountsFromTheLastOfTwoBreaks)
 {
     playUntilBroken(6);
     owners[9] = ofPlayer;
-    add(0, "Playback.Start", {}, false, {.source = 3, .session = 9});
-    breakOff(9, 12);
-    EXPECT_THAT(continued(ofPlayer).back(), "played from 12.000000 for 3.000000 on ? in ?/? at ?: stopped");
+    goOn(8, 0, {.source = 3, .session = 9});
+    breakOff(9, 11);
+    // The two seconds before 8 are counted in place of the last two before 11.
+    EXPECT_THAT(continued(ofPlayer, 0),
+                ElementsAre("played from 0.000000 for 6.000000 on ? in ?/? at ?: vanished",
+                            "played from 8.000000 for 3.000000 on ? in ?/? at ?: vanished",
+                            "played from 9.000000 for 6.000000 on ? in ?/? at ?: stopped"));
+}
+
+TEST_F(StretchesContinuedTest, CountsFromTheThirdBreakOn)
+{
+    playUntilBroken(6);
+    for (const std::uint64_t session : {9U, 10U}) {
+        owners[session] = ofPlayer;
+        goOn(6, 0, {.source = 3, .session = session});
+        breakOff(session, 8);
+    }
+    EXPECT_THAT(continued(ofPlayer, 0).back(), "played from 10.000000 for 5.000000 on ? in ?/? at ?: stopped");
+}
+
+TEST_F(StretchesContinuedTest, CountsNothingOfWhatLiesBeforeTheBreak)
+{
+    playUntilBroken();
+    owners[8] = ofPlayer;
+    goOn(12, 4, next);
+    add(9, "RouteChange.State", {{"active_devices", "headset"}}, true, next);
+    add(15, "Playback.Stop", {}, true, next);
+    EXPECT_THAT(ended(),
+                ElementsAre("played from 0.000000 for 10.000000 on ? in ?/? at ?: vanished",
+                            "played from 10.000000 for 5.000000 on headset in ?/? at ?: stopped"));
+    EXPECT_EQ(stretches.takeLeftOut(), 1U);
+}
+
+TEST_F(StretchesContinuedTest, TellsPlayingFromRecording)
+{
+    add(5, "Record.Start", {});
+    playUntilBroken();
+    owners[8] = ofPlayer;
+    goOn(12, 0, next);
+    batch.add(began + 12, next, "com.quarn.kesto.Record.Start", {{"kestoreporting_timestamp", began + 5}});
+    add(15, "Playback.Stop", {}, true, next);
+    add(16, "Record.Stop", {}, true, next);
+    EXPECT_THAT(ended(),
+                ElementsAre("played from 0.000000 for 10.000000 on ? in ?/? at ?: vanished",
+                            "recorded from 5.000000 for 5.000000 on ? in ?/? at ?: vanished",
+                            "played from 10.000000 for 5.000000 on ? in ?/? at ?: stopped",
+                            "recorded from 10.000000 for 6.000000 on ? in ?/? at ?: stopped"));
+}
+
+TEST_F(StretchesContinuedTest, CountsInFullAfterAClockWasSetBack)
+{
+    playUntilBroken();
+    EXPECT_THAT(continued(ofPlayer, -3600, -3500).back(),
+                "played from -3600.000000 for 100.000000 on ? in ?/? at ?: stopped");
+}
+
+TEST_F(StretchesContinuedTest, GoesByTheClientsClock)
+{
+    batch.add(began, player, "com.quarn.kesto.Playback.Start", {{"kestoreporting_timestamp", 100}});
+    breakOff(7, 10);
+    owners[8] = ofPlayer;
+    batch.add(began + 12, next, "com.quarn.kesto.Playback.Start", {{"kestoreporting_timestamp", 100}});
+    batch.add(began + 20, next, "com.quarn.kesto.Playback.Stop", {{"kestoreporting_timestamp", 120}});
+    takeBatch();
+    ASSERT_EQ(stretches.ended().size(), 2U);
+    EXPECT_EQ(stretches.ended()[0].seconds, 10);
+    EXPECT_EQ(stretches.ended()[1].began, 110);
+    EXPECT_EQ(stretches.ended()[1].seconds, 10);
 }
 
 TEST_F(StretchesContinuedTest, AnotherUserProcessOrReporterContinuesNothing)
