@@ -20,11 +20,11 @@ struct Wish {
     std::size_t sessions = 600;
     // Where the days begin in some time zone, and where the last of them ends. The last is the present.
     std::vector<double> midnights = {};
-    // Messages of each session that change nothing, beside those that do: a store that is to be large.
+    // Messages that change nothing, each time a session plays, beside those that do: a store that is to be large.
     std::size_t idleMessages = 0;
 };
 
-// Midnights of so many days in UTC, the last at that time.
+// The beginnings of so many days of 24 hours, the last of which ends at that time.
 [[nodiscard]] std::vector<double> midnightsBefore(double end, std::size_t days);
 
 enum class Ending : std::uint8_t { Change, Stopped, Vanished, ServiceEnded, None }; // None: it runs

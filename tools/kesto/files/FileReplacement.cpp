@@ -2,6 +2,7 @@
 // file.
 #include "kesto/files/FileReplacement.h"
 
+#include "kesto/Terminal.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/files/WriteAll.h"
 
@@ -22,7 +23,7 @@ namespace {
 std::runtime_error failure(std::string_view what, const fs::path& path, int error)
 {
     return std::runtime_error(
-        fmt::format("cannot {} {}: {}", what, path.native(), std::generic_category().message(error)));
+        fmt::format("cannot {} {}: {}", what, printable(path.native()), std::generic_category().message(error)));
 }
 
 // Another user's file changes its owner, unless root replaces it.
@@ -34,16 +35,15 @@ bool takeOver(int file, const struct stat& before)
 
 } // namespace
 
-void replaceFile(const fs::path& path, std::string_view text)
+void replaceFile(const fs::path& path, std::string_view text, mode_t permissionsOfNew)
 {
-    constexpr mode_t readableByAll = 0644;
     struct stat before{};
     const bool isThere = ::stat(path.c_str(), &before) == 0;
     std::string temporary = path.parent_path() / ".kesto-XXXXXX";
     platform::FileDescriptor file(::mkostemp(temporary.data(), O_CLOEXEC));
     if (!file)
         throw failure("write", path, errno);
-    const bool isReady = isThere ? takeOver(file.get(), before) : ::fchmod(file.get(), readableByAll) == 0;
+    const bool isReady = isThere ? takeOver(file.get(), before) : ::fchmod(file.get(), permissionsOfNew) == 0;
     int error = isReady ? platform::writeAll(file.get(), text) : errno;
     if (error == 0 && ::fsync(file.get()) != 0)
         error = errno;

@@ -1,7 +1,8 @@
-// All errors of writing have one form.
+// A file that is replaced as a whole is the business of FileReplacement; here is found which file that is.
 #include "kesto/files/OutputFile.h"
 
 #include "kesto/Terminal.h"
+#include "kesto/files/FileReplacement.h"
 #include "platform/linux/files/FileDescriptor.h"
 #include "platform/linux/files/WriteAll.h"
 
@@ -13,19 +14,37 @@
 #include <system_error>
 #include <unistd.h>
 
+namespace fs = std::filesystem;
+
 namespace {
 
 constexpr mode_t asTheUmaskAllows = 0666;
 
-std::runtime_error failure(const std::filesystem::path& path, int error)
+std::runtime_error failure(const fs::path& path, int error)
 {
     return std::runtime_error(
         fmt::format("cannot write {}: {}", printable(path.native()), std::generic_category().message(error)));
 }
 
+// The system tells the mask only in exchange for another.
+mode_t fileModeMask()
+{
+    const mode_t mask = ::umask(0);
+    ::umask(mask);
+    return mask;
+}
+
+// Where links lead to that end at no file.
+fs::path behindLinks(fs::path path)
+{
+    while (fs::is_symlink(path))
+        path = path.parent_path() / fs::read_symlink(path);
+    return path;
+}
+
 } // namespace
 
-void writeOutput(const std::filesystem::path& path, std::string_view text)
+void writeOutput(const fs::path& path, std::string_view text)
 {
     const platform::FileDescriptor file(
         ::open(path.c_str(), O_WRONLY | O_CREAT | O_TRUNC | O_NOCTTY | O_CLOEXEC, asTheUmaskAllows));
@@ -33,25 +52,13 @@ void writeOutput(const std::filesystem::path& path, std::string_view text)
         throw failure(path, error);
 }
 
-void writeWholeOutput(const std::filesystem::path& path, std::string_view text)
+void writeWholeOutput(const fs::path& path, std::string_view text)
 {
     struct stat before{};
-    const bool isThere = ::stat(path.c_str(), &before) == 0;
-    if (isThere && !S_ISREG(before.st_mode))
+    const int error = ::stat(path.c_str(), &before) == 0 ? 0 : errno;
+    if (error != 0 && error != ENOENT)
+        throw failure(path, error);
+    if (error == 0 && !S_ISREG(before.st_mode))
         return writeOutput(path, text);
-    std::error_code unresolved; // a path that cannot be resolved cannot be written either, which the next call says
-    const std::filesystem::path place = isThere ? std::filesystem::canonical(path, unresolved) : path;
-    const std::string beside = fmt::format("{}.{}.new", place.native(), ::getpid());
-    const mode_t permissions = isThere ? before.st_mode & ACCESSPERMS : asTheUmaskAllows;
-    platform::FileDescriptor file(
-        ::open(beside.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, permissions));
-    if (!file)
-        throw failure(path, errno);
-    int error = isThere && ::fchmod(file.get(), permissions) != 0 ? errno : platform::writeAll(file.get(), text);
-    file = {};
-    if (error == 0 && ::rename(beside.c_str(), place.c_str()) == 0)
-        return;
-    error = error == 0 ? errno : error;
-    ::unlink(beside.c_str());
-    throw failure(path, error);
+    replaceFile(error == 0 ? fs::canonical(path) : behindLinks(path), text, asTheUmaskAllows & ~fileModeMask());
 }

@@ -8,6 +8,7 @@
 // Throws std::runtime_error, which names the path.
 void writeOutput(const std::filesystem::path& path, std::string_view text);
 
-// The same, but whoever opens a file at the path finds the old text or the new one, never a part: it is written beside
-// its place and renamed, with the permissions of the file that it replaces. A link goes on to lead to it.
+// The same, but whoever opens a file at the path finds the old text or the new one, never a part: the file is replaced
+// (FileReplacement.h), and a new one has the permissions that the umask allows. A link goes on to lead to it, also one
+// to a file that does not exist yet. For one thread: the umask is that of the process.
 void writeWholeOutput(const std::filesystem::path& path, std::string_view text);

@@ -1,4 +1,5 @@
 // Which device had which share of the time.
+#include "kesto/report/ReportWords.h"
 #include "kesto/report/page/PageColumns.h"
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"

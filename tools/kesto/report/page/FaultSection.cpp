@@ -20,13 +20,13 @@ const char* heatOf(double rate)
 std::string cell(const PageColumn::Device& device, const PageWords& words)
 {
     constexpr double hour = 3600;
-    const std::string note = words.hasNotes && device.seconds > 0
-        ? fmt::format(" title=\"in {}\"", durationText(device.seconds))
-        : std::string();
+    const bool isPlayed = device.seconds > 0;
+    const std::string note =
+        words.hasNotes && isPlayed ? fmt::format(" title=\"in {}\"", durationText(device.seconds)) : std::string();
     if (device.faults == 0)
-        return device.seconds > 0 ? fmt::format("<td{}>0", note) : "<td class=no>–";
-    const double rate = device.seconds > 0 ? static_cast<double>(device.faults) * hour / device.seconds : hour;
-    return fmt::format("<td class={}{}>{}", heatOf(rate), note, device.faults);
+        return isPlayed ? fmt::format("<td{}>0", note) : "<td class=no>–";
+    const char* const heat = isPlayed ? heatOf(static_cast<double>(device.faults) * hour / device.seconds) : "h4";
+    return fmt::format("<td class={}{}>{}", heat, note, device.faults);
 }
 
 constexpr std::size_t mostWideColumns = 16;
@@ -39,7 +39,7 @@ bool isCrowded(const PageColumns& columns)
 std::string columnHead(const PageColumns& columns, const PageColumn& column)
 {
     const std::string name = columns.name(column);
-    if (columns.unit == ColumnUnit::Year)
+    if (columns.unit == ColumnUnit::Year || columns.unit == ColumnUnit::Decade)
         return "<th scope=col>" + name;
     const auto month = monthName(column.first).substr(0, 3);
     if (columns.unit == ColumnUnit::Month)
@@ -107,8 +107,9 @@ std::string kindsOf(const Report& report)
     const std::size_t named = namedOf(report.faultKinds.size(), mostKinds);
     std::string html = "<p class=note>Kinds: ";
     for (std::size_t index = 0; index < named; ++index)
-        html += fmt::format("{}<bdi>{}</bdi> {}", index == 0 ? "" : ", ", htmlName(report.faultKinds[index].key),
-                            report.faultKinds[index].played.faults);
+        html +=
+            fmt::format("{}<bdi>{}</bdi> {}", index == 0 ? "" : ", ",
+                        htmlName(report.faultKinds[index].key, longestLabel), report.faultKinds[index].played.faults);
     return html + (report.faultKinds.size() > named ? ", " + othersText(report.faultKinds.size(), named) : "");
 }
 

@@ -19,6 +19,7 @@ chrono::year_month_day firstOf(chrono::year_month_day date, ColumnUnit unit)
     case ColumnUnit::Week: return day - (chrono::weekday(day) - chrono::Monday);
     case ColumnUnit::Month: return date.year() / date.month() / 1;
     case ColumnUnit::Year: return date.year() / 1 / 1;
+    case ColumnUnit::Decade: return chrono::year(static_cast<int>(date.year()) / 10 * 10) / 1 / 1;
     }
     return date;
 }
@@ -67,7 +68,8 @@ std::size_t placesOf(std::size_t count, std::size_t most)
 PageColumns columnsOf(const Report& report, std::size_t most)
 {
     PageColumns made;
-    for (const ColumnUnit unit : {ColumnUnit::Day, ColumnUnit::Week, ColumnUnit::Month, ColumnUnit::Year}) {
+    for (const ColumnUnit unit :
+         {ColumnUnit::Day, ColumnUnit::Week, ColumnUnit::Month, ColumnUnit::Year, ColumnUnit::Decade}) {
         made.unit = unit;
         if (countOf(report.days, unit) <= most)
             break;
@@ -92,13 +94,14 @@ std::string PageColumns::name(const PageColumn& column) const
     case ColumnUnit::Week: return fmt::format("week of {}", dayText(column.first));
     case ColumnUnit::Month: return fmt::format("{} {}", monthName(column.first), year);
     case ColumnUnit::Year: return fmt::format("{}", year);
+    case ColumnUnit::Decade: return fmt::format("{}s", year);
     }
     return {};
 }
 
 std::string PageColumns::heading() const
 {
-    constexpr std::array<const char*, 4> headings{"Day", "Week", "Month", "Year"};
+    constexpr std::array<const char*, 5> headings{"Day", "Week", "Month", "Year", "Decade"};
     return headings[static_cast<std::size_t>(unit)];
 }
 

@@ -1,4 +1,5 @@
-// The days of a report as columns of a picture. Too many days are put together: as weeks, as months, as years.
+// The days of a report as columns of a picture. Too many days are put together: as weeks, as months, as years, as
+// decades.
 #pragma once
 
 #include "kesto/report/Report.h"
@@ -8,7 +9,7 @@
 #include <string>
 #include <vector>
 
-enum class ColumnUnit { Day, Week, Month, Year };
+enum class ColumnUnit { Day, Week, Month, Year, Decade };
 
 struct PageColumn {
     std::chrono::year_month_day first;
@@ -25,13 +26,13 @@ struct PageColumns {
     ColumnUnit unit = ColumnUnit::Day;
     std::vector<PageColumn> columns;
 
-    // "Sun 8 Nov", "week of Mon 9 Nov", "November 2026", "2026".
+    // "Sun 8 Nov", "week of Mon 9 Nov", "November 2026", "2026", "2020s".
     [[nodiscard]] std::string name(const PageColumn& column) const;
-    // In a table's first column: "Day", "Week of", "Month", "Year".
+    // In a table's first column: "Day", "Week", "Month", "Year", "Decade".
     [[nodiscard]] std::string heading() const;
 };
 
-// In the finest unit of which there are at most so many.
+// In the finest unit of which there are at most so many. Decades are never too many: the calendar has two dozen.
 [[nodiscard]] PageColumns columnsOf(const Report& report, std::size_t most);
 
 // How many applications and devices the page names. All beyond are "others".

@@ -9,7 +9,7 @@
 
 struct PageWords {
     bool isUTC = false; // moments are in UTC, else in the time zone of the process
-    bool hasNotes = true; // what a pointer shows at a mark
+    bool hasNotes = true; // what a pointer shows at a mark; without them, pictures are coarser, too
     bool isRecording = false;
 
     [[nodiscard]] std::string_view played() const { return isRecording ? "recorded" : "played"; }

@@ -3,6 +3,7 @@
 #include "kesto/report/page/PageText.h"
 
 #include "foundation/text/LocalTime.h"
+#include "kesto/report/ReportWords.h"
 
 #include <algorithm>
 #include <array>
@@ -94,16 +95,10 @@ void appendEscaped(char32_t character, std::string& out)
 constexpr std::array<std::string_view, 12> months{"January",   "February", "March",    "April",
                                                   "May",       "June",     "July",     "August",
                                                   "September", "October",  "November", "December"};
-constexpr std::array<std::string_view, 7> weekdays{"Sun", "Mon", "Tue", "Wed", "Thu", "Fri", "Sat"};
 
 unsigned dayOf(chrono::year_month_day date)
 {
     return static_cast<unsigned>(date.day());
-}
-
-unsigned weekdayOf(chrono::year_month_day date)
-{
-    return chrono::weekday(chrono::sys_days(date)).c_encoding();
 }
 
 } // namespace
@@ -189,11 +184,6 @@ std::string rateText(const std::optional<double>& rate)
     return !rate ? "–" : *rate > 0 && *rate < 0.005 ? "&lt;0.01" : fmt::format("{:.2f}", *rate);
 }
 
-std::string countText(std::size_t count, std::string_view noun)
-{
-    return fmt::format("{} {}{}", count, noun, count == 1 ? "" : "s");
-}
-
 std::string_view monthName(chrono::year_month_day date)
 {
     return months[static_cast<unsigned>(date.month()) - 1];
@@ -201,12 +191,13 @@ std::string_view monthName(chrono::year_month_day date)
 
 bool isWeekend(chrono::year_month_day date)
 {
-    return weekdayOf(date) == 0 || weekdayOf(date) == 6;
+    const chrono::weekday weekday{chrono::sys_days(date)};
+    return weekday == chrono::Saturday || weekday == chrono::Sunday;
 }
 
 std::string dayText(chrono::year_month_day date)
 {
-    return fmt::format("{} {} {}", weekdays[weekdayOf(date)], dayOf(date), monthName(date).substr(0, 3));
+    return fmt::format("{} {} {}", weekdayName(date), dayOf(date), monthName(date).substr(0, 3));
 }
 
 std::string daysText(chrono::year_month_day first, chrono::year_month_day last)

@@ -28,8 +28,6 @@ constexpr std::size_t longestShortName = 28; // characters, beside marks
 [[nodiscard]] std::string percentText(double part, double whole);
 // "0.55"; a dash if there is none.
 [[nodiscard]] std::string rateText(const std::optional<double>& rate);
-// "1 session", "2 sessions".
-[[nodiscard]] std::string countText(std::size_t count, std::string_view noun);
 
 // "Sun 8 Nov".
 [[nodiscard]] std::string dayText(std::chrono::year_month_day date);

@@ -1,6 +1,7 @@
 // The head allows the page's own style and nothing else; a browser refuses whatever a client might have smuggled in.
 #include "kesto/report/page/ReportPage.h"
 
+#include "kesto/report/ReportWords.h"
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageStyle.h"
 #include "kesto/report/page/PageText.h"

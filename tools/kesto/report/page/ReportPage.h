@@ -1,8 +1,8 @@
 // The report as one page that any browser shows: it runs no script, loads nothing, and asks nobody.
 //
 // What clients told is shown as text and as nothing else, whatever it contains. The page stays below 100,000 bytes: of
-// many applications and devices it names those with the most time, many days become weeks, and marks lose the notes
-// that a pointer shows before the page grows beyond that.
+// many applications and devices it names those with the most time, and many days become weeks. Before the page grows
+// beyond that, marks lose the notes that a pointer shows, and pictures are coarser.
 #pragma once
 
 #include "kesto/report/Report.h"

@@ -181,7 +181,7 @@ private:
         return isMonday && leftOf(index) < width - halfOfLabel ? name.substr(name.find(' ') + 1) : std::string();
     }
 
-    // Of weeks, months and years, as many as there is room for.
+    // Of weeks, months, years and decades, as many as there is room for.
     [[nodiscard]] std::string labelOfMany(const PageColumn& column, std::size_t index) const
     {
         const auto every = static_cast<std::size_t>(std::ceil(1.3 * roomForName / pitch_));
@@ -190,8 +190,8 @@ private:
         const auto month = monthName(column.first).substr(0, 3);
         if (columns_.unit == ColumnUnit::Week)
             return fmt::format("{} {}", static_cast<unsigned>(column.first.day()), month);
-        const int year = static_cast<int>(column.first.year());
-        return columns_.unit == ColumnUnit::Month ? fmt::format("{} {}", month, year) : fmt::format("{}", year);
+        return columns_.unit == ColumnUnit::Month ? fmt::format("{} {}", month, static_cast<int>(column.first.year()))
+                                                  : columns_.name(column);
     }
 
     [[nodiscard]] bool isInMonthOf(std::size_t one, std::size_t other) const
@@ -243,9 +243,12 @@ PageTable tableOf(const PageColumns& columns, const Applications& applications)
     return table;
 }
 
-// What is unusual about the length of days: where clocks change, and where the report begins or ends within a day.
-std::string lengthsOf(const Report& report)
+// What is unusual about the length of days: where clocks change, and where the report begins or ends within a day. Of
+// days that are put together nothing: there can be hundreds.
+std::string lengthsOf(const Report& report, ColumnUnit unit)
 {
+    if (unit != ColumnUnit::Day)
+        return {};
     constexpr double day = 86400;
     constexpr double tolerance = 60;
     std::string text;
@@ -267,7 +270,7 @@ std::string lengthsOf(const Report& report)
 
 std::string timeSection(const Report& report, const PageWords& words)
 {
-    const PageColumns columns = columnsOf(report, mostColumns);
+    const PageColumns columns = columnsOf(report, words.hasNotes ? mostColumns : mostColumns / 2);
     const Applications applications(report);
     std::string period = columns.heading();
     period.front() = static_cast<char>(period.front() + ('a' - 'A'));
@@ -276,7 +279,7 @@ std::string timeSection(const Report& report, const PageWords& words)
                     report.isOverlapping ? "; streams at the same time each count" : "");
     html += legend(applications);
     html += "<div class=scroll tabindex=0>" + Bars(columns, applications, words).draw() + "</div>";
-    if (const std::string lengths = lengthsOf(report); !lengths.empty())
+    if (const std::string lengths = lengthsOf(report, columns.unit); !lengths.empty())
         html += "<p class=note>" + lengths;
     return html + tableHTML(tableOf(columns, applications)) + "</section>";
 }

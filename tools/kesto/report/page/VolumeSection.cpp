@@ -4,7 +4,6 @@
 #include "kesto/report/page/Svg.h"
 
 #include <algorithm>
-#include <array>
 #include <cmath>
 #include <fmt/format.h>
 

@@ -1,4 +1,5 @@
 // The sessions that kept up worst, each with its course: when it played on which device, and where its faults were.
+#include "kesto/report/ReportWords.h"
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"
 #include "kesto/report/page/Svg.h"
@@ -26,7 +27,7 @@ public:
     Timeline(const WorstSession& worst, const TimeSpan& span, const PageWords& words)
         : worst_(worst),
           words_(words),
-          steps_(words.hasNotes ? 200 : 100),
+          steps_(words.hasNotes ? 200 : 50),
           svg_(width, height,
                fmt::format("{} in {}", countText(worst.played.faults, "fault"), durationText(worst.played.seconds)),
                "line")
@@ -148,11 +149,20 @@ private:
     double until_ = 0;
 };
 
+constexpr std::string_view dayAndTime = "{:%a %e %b, %H:%M}";
+
+// The day only if it is another than that on which it began.
+std::string endTime(double began, double ended, bool isUTC)
+{
+    const auto dayOf = [isUTC](double moment) { return pageMoment(moment, isUTC, "{:%F}"); };
+    return pageMoment(ended, isUTC, dayOf(began) == dayOf(ended) ? "{:%H:%M}" : dayAndTime);
+}
+
 std::string endOf(const WorstSession& worst, const PageWords& words)
 {
     return worst.isRunning    ? words.isRecording ? "still records" : "still plays"
         : worst.hasVanished   ? "vanished"
-        : worst.session.ended ? pageMoment(*worst.session.ended, words.isUTC, "{:%H:%M}")
+        : worst.session.ended ? endTime(worst.session.began, *worst.session.ended, words.isUTC)
                               : "not told";
 }
 
@@ -172,8 +182,8 @@ std::string rowOf(const WorstSession& worst, const TimeSpan& span, const PageWor
 {
     return fmt::format("<tr><th scope=row>{}<td class=l>{}<td class=l>{}<td class=l><bdi>{}</bdi><td>{}<td>{}<td>{}"
                        "<td>{}<td class=l>{}<td class=l>{}",
-                       worst.session.id, pageMoment(worst.session.began, words.isUTC, "{:%a %e %b, %H:%M}"),
-                       who(worst.session), htmlDevices(worst.devices, longestLabel), durationText(worst.played.seconds),
+                       worst.session.id, pageMoment(worst.session.began, words.isUTC, dayAndTime), who(worst.session),
+                       htmlDevices(worst.devices, longestLabel), durationText(worst.played.seconds),
                        worst.played.faults, worst.lateCycles, rateText(worst.played.faultsAnHour()),
                        Timeline(worst, span, words).draw(), endOf(worst, words));
 }

@@ -1,4 +1,4 @@
-// Chromium as Debian packages it. It gets a network of its own that nothing else is in, where the system allows that.
+// Chromium as Debian packages it. It gets a network of its own that nothing else is in.
 #include "tools/kesto/report/page/Browser.h"
 
 #include "sdk/Process.h"
@@ -12,27 +12,30 @@ namespace {
 
 using sdk_test::run;
 
-bool succeeds(const std::vector<std::string>& command)
-{
-    return run(command).status == 0;
-}
-
 std::vector<std::string> withoutNetwork()
 {
-    const std::vector<std::string> inNamespace = ::geteuid() == 0
-        ? std::vector<std::string>{"unshare", "--net"}
-        : std::vector<std::string>{"unshare", "--net", "--map-root-user"};
-    auto probe = inNamespace;
+    return ::geteuid() == 0 ? std::vector<std::string>{"unshare", "--net"}
+                            : std::vector<std::string>{"unshare", "--net", "--map-root-user"};
+}
+
+std::string findMissing()
+{
+    if (run({"sh", "-c", "command -v chromium"}).status != 0)
+        return "there is no chromium: apt-get install chromium";
+    auto probe = withoutNetwork();
     probe.emplace_back("true");
-    return succeeds(probe) ? inNamespace : std::vector<std::string>{"env"};
+    const auto finished = run(probe);
+    return finished.status == 0
+        ? std::string()
+        : "the browser would have a network: allow this user to make a network namespace (" + finished.errors + ")";
 }
 
 } // namespace
 
-bool Browser::isInstalled()
+const std::string& Browser::missing()
 {
-    static const bool isThere = succeeds({"sh", "-c", "command -v chromium"});
-    return isThere;
+    static const std::string missing = findMissing();
+    return missing;
 }
 
 std::vector<std::string> Browser::command(const std::vector<std::string>& further) const

@@ -11,7 +11,8 @@ namespace kesto_tool {
 
 class Browser {
 public:
-    [[nodiscard]] static bool isInstalled();
+    // What is missing for it on this machine, and what to do; empty: nothing.
+    [[nodiscard]] static const std::string& missing();
 
     struct Opened {
         std::string document; // as the browser has it, as HTML

@@ -15,9 +15,11 @@ struct MadeReportWish {
     std::size_t days = 14;
     std::size_t applications = 5;
     std::size_t devices = 4;
+    std::size_t formats = 1;
+    std::size_t kinds = 1;
     std::size_t worst = 3;
     std::size_t marks = 6; // stretches, and faults, of each of the worst
-    std::string name = {}; // behind the number of each application and device
+    std::string name = {}; // behind the number of each application and device, and behind formats and kinds of faults
 };
 
 inline Played madePlayed(double seconds, std::size_t faults)
@@ -100,8 +102,10 @@ inline Report madeReport(const MadeReportWish& wish = {})
         report.devices.push_back(
             {"device " + std::to_string(index + 1) + wish.name,
              madePlayed(days * hour / static_cast<double>(index + 1), index == 0 ? report.all.faults : 0)});
-    report.formats.push_back({"S16LE/44100/2" + wish.name, madePlayed(report.all.seconds, report.all.faults)});
-    report.faultKinds.push_back({"IssueDetector" + wish.name, {.sessions = 3, .faults = report.all.faults}});
+    for (std::size_t index = 0; index < wish.formats; ++index)
+        report.formats.push_back({"S16LE/44100/2" + wish.name, madePlayed(report.all.seconds, report.all.faults)});
+    for (std::size_t index = 0; index < wish.kinds; ++index)
+        report.faultKinds.push_back({"IssueDetector" + wish.name, {.sessions = 3, .faults = report.all.faults}});
     const std::size_t faults = report.all.faults;
     report.all = madePlayed(report.all.seconds, faults);
     report.all.sessions = 50;

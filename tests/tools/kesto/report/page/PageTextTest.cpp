@@ -1,5 +1,6 @@
 // Names that strangers chose cannot be more than text, and figures say no more and no less than there is.
 #include "kesto/report/page/PageText.h"
+#include "kesto/report/ReportWords.h"
 
 #include <chrono>
 #include <gtest/gtest.h>

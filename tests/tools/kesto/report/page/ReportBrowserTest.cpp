@@ -20,8 +20,8 @@ class ReportBrowser : public testing::Test {
 protected:
     void SetUp() override
     {
-        if (!Browser::isInstalled())
-            GTEST_SKIP() << "there is no chromium: apt-get install chromium";
+        if (!Browser::missing().empty())
+            GTEST_SKIP() << Browser::missing();
     }
 
     std::filesystem::path write(const std::string& page) const

@@ -14,6 +14,7 @@
 #include <map>
 #include <memory>
 #include <regex>
+#include <sstream>
 #include <string>
 #include <vector>
 
@@ -74,7 +75,7 @@ TEST_F(ReportHtml, ReplacesAFileAtOnce)
     EXPECT_EQ(tool_.print(report({"--html", page_})), "");
     EXPECT_EQ(support::readFile(directory_ / "link"), "old") << "written beside it, and renamed";
     EXPECT_THAT(support::readFile(page_), StartsWith("<!doctype html>"));
-    EXPECT_THAT(support::namesIn(directory_.path()), testing::Not(testing::Contains(testing::EndsWith(".new"))));
+    EXPECT_THAT(support::namesIn(directory_.path()), testing::Not(testing::Contains(StartsWith(".kesto"))));
 }
 
 TEST_F(ReportHtml, SaysThatItCannotWrite)
@@ -107,8 +108,8 @@ class ReportHtmlInBrowser : public ReportHtml {
 protected:
     void SetUp() override
     {
-        if (!Browser::isInstalled())
-            GTEST_SKIP() << "there is no chromium: apt-get install chromium";
+        if (!Browser::missing().empty())
+            GTEST_SKIP() << Browser::missing();
         ASSERT_EQ(tool_.print(report({"--html", page_})), "");
     }
 
@@ -125,7 +126,8 @@ protected:
                     " SELECT session, recording, began, (SELECT wall_time FROM store) - began, device, volume FROM "
                     "open_stretches)"
                     " s JOIN sessions e ON e.id = s.session WHERE s.recording = 0),"
-                    " faults AS (SELECT session, happened, payload ->> 'active_devices' AS device FROM events"
+                    " faults AS (SELECT session, happened, payload ->> 'active_devices' AS device,"
+                    " payload ->> 'late_cycles' AS cycles FROM events"
                     " WHERE name = 'com.quarn.kesto.Error.IssueDetector' AND session IN (SELECT session FROM played)) "
                     + question);
         EXPECT_TRUE(statement.has_value() && statement->step().value_or(false)) << question;
@@ -145,29 +147,44 @@ protected:
     Browser browser_;
 };
 
-// The texts of the cells of each row of the table with that summary. The browser closes and quotes everything.
-std::vector<std::vector<std::string>> rowsOf(const std::string& document, const std::string& summary)
+// What stands between the two at each place. The browser closes everything.
+std::vector<std::string> partsBetween(const std::string& text, const std::string& before, const std::string& behind)
 {
-    const auto from = document.find("<summary>" + summary + "</summary>");
-    EXPECT_NE(from, std::string::npos) << summary;
-    const std::string table = document.substr(from, document.find("</table>", from) - from);
+    std::vector<std::string> parts;
+    for (auto at = text.find(before); at != std::string::npos; at = text.find(before, at + 1)) {
+        const auto from = at + before.size();
+        parts.push_back(text.substr(from, text.find(behind, from) - from));
+    }
+    return parts;
+}
+
+// The texts of the cells of each row of the table that begins behind this.
+std::vector<std::vector<std::string>> rowsOf(const std::string& document, const std::string& beginning)
+{
+    const auto from = document.find(beginning);
+    EXPECT_NE(from, std::string::npos) << beginning;
     std::vector<std::vector<std::string>> rows;
-    const std::regex row("<tr>(.*?)</tr>");
-    const std::regex cell("<t[hd][^>]*>(.*?)</t[hd]>");
-    for (std::sregex_iterator found(table.begin(), table.end(), row), end; found != end; ++found) {
-        const std::string cells = (*found)[1];
+    for (const std::string& row :
+         partsBetween(document.substr(from, document.find("</table>", from) - from), "<tr>", "</tr>")) {
         rows.emplace_back();
-        for (std::sregex_iterator each(cells.begin(), cells.end(), cell); each != end; ++each)
-            rows.back().push_back(std::regex_replace(std::string((*each)[1]), std::regex("</?bdi>"), ""));
+        for (const std::string& cell : partsBetween(std::regex_replace(row, std::regex("<th"), "<td"), "<td", "</t")) {
+            const std::string text = cell.substr(cell.find('>') + 1);
+            rows.back().push_back(std::regex_replace(text, std::regex("</?bdi>"), ""));
+        }
     }
     return rows;
+}
+
+std::string conditionOf(const std::string& device)
+{
+    return device == "not told" ? "device IS NULL" : "device = '" + device + "'";
 }
 
 TEST_F(ReportHtmlInBrowser, ShowsTheFiguresThatSQLFinds)
 {
     const Browser::Opened opened = browser_.open(page_);
     EXPECT_THAT(opened.messages, IsEmpty());
-    const auto days = rowsOf(opened.document, "Hours as a table");
+    const auto days = rowsOf(opened.document, "<summary>Hours as a table");
     ASSERT_EQ(days.size(), 15U); // the head and 14 days
     ASSERT_EQ(days[0].size(), 7U); // the day, five applications, all
     const auto expectHours = [](const std::string& shown, const std::string& found, const std::string& what) {
@@ -188,19 +205,27 @@ TEST_F(ReportHtmlInBrowser, ShowsTheFiguresThatSQLFinds)
     EXPECT_THAT(opened.document, HasSubstr("<dd>" + ask("SELECT count(*) FROM faults") + "</dd>"));
 }
 
+// By time; neither muted times nor those without a volume count.
+const std::string meanVolume = "SELECT printf('%.0f %%', 100 * sum((ended - began) * volume) / sum(ended - began))"
+                               " FROM played WHERE volume > 0";
+
 TEST_F(ReportHtmlInBrowser, ShowsTheFiguresOfDevicesAndVolumesThatSQLFinds)
 {
     const Browser::Opened opened = browser_.open(page_);
-    const auto devices = rowsOf(opened.document, "Devices as a table");
+    const auto devices = rowsOf(opened.document, "<summary>Devices as a table");
     ASSERT_GE(devices.size(), 6U);
     for (std::size_t row = 1; row < devices.size(); ++row) {
-        const std::string isIt =
-            devices[row][0] == "not told" ? "device IS NULL" : "device = '" + devices[row][0] + "'";
+        const std::string isIt = conditionOf(devices[row][0]);
         EXPECT_EQ(devices[row][1], ask("SELECT printf('%.2f', sum(ended - began) / 3600) FROM played WHERE " + isIt));
         EXPECT_EQ(devices[row][3], ask("SELECT count(DISTINCT session) FROM played WHERE " + isIt));
         EXPECT_EQ(devices[row][4], ask("SELECT count(*) FROM faults WHERE " + isIt)) << devices[row][0];
+        EXPECT_EQ(devices[row][5],
+                  ask("SELECT printf('%.2f', (SELECT count(*) FROM faults WHERE " + isIt
+                      + ") * 3600.0 / sum(ended - began)) FROM played WHERE " + isIt));
+        EXPECT_EQ(devices[row][6], ask(meanVolume + " AND " + isIt)) << devices[row][0];
     }
-    const auto volumes = rowsOf(opened.document, "Volume as a table");
+    EXPECT_THAT(opened.document, HasSubstr(">mean " + ask(meanVolume) + "<"));
+    const auto volumes = rowsOf(opened.document, "<summary>Volume as a table");
     ASSERT_EQ(volumes.size(), 19U); // the head, muted, sixteen steps, not told
     const auto hoursAt = [&](const std::string& condition) {
         return ask("SELECT iif(total(ended - began) = 0, '0', printf('%.2f', total(ended - began) / 3600))"
@@ -212,6 +237,69 @@ TEST_F(ReportHtmlInBrowser, ShowsTheFiguresOfDevicesAndVolumesThatSQLFinds)
         EXPECT_EQ(volumes[static_cast<std::size_t>(step) + 2][1],
                   hoursAt(fmt::format("volume > {} / 16.0 AND volume <= {} / 16.0", step, step + 1)));
     EXPECT_EQ(volumes[18][1], hoursAt("volume IS NULL"));
+}
+
+TEST_F(ReportHtmlInBrowser, ShowsTheFaultsOfEachDeviceAndDayThatSQLFinds)
+{
+    const Browser::Opened opened = browser_.open(page_);
+    const auto devices = rowsOf(opened.document, "<summary>Devices as a table"); // with whole names, in the same order
+    const auto faults = rowsOf(opened.document, "<table class=\"heat");
+    ASSERT_EQ(faults.size(), devices.size());
+    ASSERT_GE(faults.size(), 6U);
+    ASSERT_EQ(faults[0].size(), 17U); // the device, 14 days, all, and for each hour
+    std::size_t withoutFault = 0;
+    std::size_t unused = 0;
+    for (std::size_t row = 1; row < faults.size(); ++row) {
+        const std::string isIt = conditionOf(devices[row][0]);
+        ASSERT_EQ(faults[row].size(), 17U);
+        for (std::size_t day = 0; day < 14; ++day) {
+            const std::string found =
+                ask(fmt::format("SELECT iif((SELECT count(*) FROM played WHERE began < {1} AND ended > {0} AND {2}), "
+                                "count(*), '–') FROM faults WHERE happened >= {0} AND happened < {1} AND {2}",
+                                days_.midnights[day], days_.midnights[day + 1], isIt));
+            EXPECT_EQ(faults[row][day + 1], found) << devices[row][0] << ", day " << day;
+            withoutFault += found == "0" ? 1 : 0;
+            unused += found == "–" ? 1 : 0;
+        }
+        EXPECT_EQ(faults[row][15], devices[row][4]);
+        EXPECT_EQ(faults[row][16], devices[row][5]);
+    }
+    EXPECT_TRUE(withoutFault > 0 && unused > 0) << "both must be in the weeks, or nothing tells them apart";
+}
+
+// "1 h 30 min" as minutes.
+double minutesIn(const std::string& text)
+{
+    double minutes = 0;
+    double number = 0;
+    std::string unit;
+    for (std::istringstream words(text); words >> number >> unit;)
+        minutes += unit == "h" ? number * 60 : unit == "min" ? number : number / 60;
+    return minutes;
+}
+
+TEST_F(ReportHtmlInBrowser, ShowsTheWorstSessionsThatSQLFinds)
+{
+    const std::string bySession = ", worst AS (SELECT session, sum(cycles) AS cycles, count(*) AS faults FROM faults"
+                                  " GROUP BY session) ";
+    const auto rows = rowsOf(browser_.open(page_).document, "<table class=\"worst");
+    ASSERT_EQ(rows.size(), 11U); // the head and ten sessions
+    std::string shown;
+    for (std::size_t row = 1; row < rows.size(); ++row) {
+        const auto& cells = rows[row];
+        ASSERT_EQ(cells.size(), 10U);
+        const std::string isIt = "session = " + cells[0];
+        EXPECT_EQ(cells[5] + " " + cells[6], ask(bySession + "SELECT faults || ' ' || cycles FROM worst WHERE " + isIt))
+            << cells[0];
+        EXPECT_NEAR(minutesIn(cells[4]), std::stod(ask("SELECT sum(ended - began) / 60 FROM played WHERE " + isIt)),
+                    0.5)
+            << cells[0];
+        shown += (row == 1 ? "" : " ") + cells[6];
+    }
+    EXPECT_EQ(shown,
+              ask(bySession
+                  + "SELECT group_concat(cycles, ' ') FROM (SELECT cycles FROM worst ORDER BY cycles DESC"
+                    " LIMIT 10)"));
 }
 
 // The build keeps these, for people who want to see it.

@@ -171,8 +171,10 @@ TEST(ReportPage, TellsHowTheWorstSessionsEnded)
     report.worst[0].isRunning = true;
     report.worst[1].hasVanished = true;
     report.worst[2].session.ended.reset();
+    report.worst[3].session.ended = *report.worst[3].session.ended + 86400;
     const std::string section = sectionOf(reportPage(report, pageHead), "Worst sessions");
-    for (const char* end : {"<td class=l>still plays", "<td class=l>vanished", "<td class=l>not told"})
+    for (const char* end :
+         {"<td class=l>still plays", "<td class=l>vanished", "<td class=l>not told", "<td class=l>Mon  9 Nov, 03:00"})
         EXPECT_EQ(countOf(end, section), 1U) << end;
 }
 
@@ -251,6 +253,13 @@ TEST(ReportPage, NamesDaysOfAnotherLength)
                 HasSubstr("<p class=note>Sun 25 Oct had 25 h 0 min. Of Mon 26 Oct, 10 h 0 min are in this report."));
 }
 
+TEST(ReportPage, NamesNoLengthOfDaysThatArePutTogether)
+{
+    Report report = madeReport({.days = 365});
+    report.days[100].span.until += 3600;
+    EXPECT_EQ(countOf("<p class=note>", sectionOf(reportPage(report, pageHead), "Time of ")), 0U);
+}
+
 // The labels below the bars.
 std::vector<std::string> labelsOf(const std::string& page)
 {
@@ -287,6 +296,11 @@ TEST(ReportPage, PutsManyDaysTogether)
     EXPECT_THAT(year, HasSubstr("<th scope=row>week of Mon 9 Nov<td>7.00"));
     EXPECT_THAT(sectionOf(year, "Faults by device"), HasSubstr("<th scope=col>Nov<br>2026<th scope=col>Dec<br>2026"));
     EXPECT_THAT(pageOf({.days = 3700}), HasSubstr("<h2>Time of playing a year</h2>"));
+    const std::string century =
+        pageOf({.first = std::chrono::year(1970) / 1 / 1, .days = 40'000, .applications = 1, .devices = 1});
+    EXPECT_THAT(century, HasSubstr("<h2>Time of playing a decade</h2>"));
+    EXPECT_THAT(century, HasSubstr("<th scope=row>1980s<td>3653.00")) << "an hour a day, with three leap days";
+    EXPECT_THAT(sectionOf(century, "Faults by device"), HasSubstr("<th scope=col>1970s<th scope=col>1980s"));
 }
 
 // --- what strangers told
@@ -352,18 +366,43 @@ TEST(ReportPage, SpeaksToThoseWhoDoNotSeeIt)
 
 // --- its size
 
+// More of everything than the page names, in names of the character that takes most bytes.
+MadeReportWish crowded(std::size_t days, std::size_t marks)
+{
+    return {.days = days,
+            .applications = 60,
+            .devices = 40,
+            .formats = 60,
+            .kinds = 60,
+            .worst = 10,
+            .marks = marks,
+            .name = std::string(200, '"')};
+}
+
 TEST(ReportPage, StaysSmall)
 {
     EXPECT_LT(pageOf({}).size(), 40'000U);
     EXPECT_LT(pageOf({.days = 31, .applications = 60, .devices = 40, .worst = 10}).size(), 80'000U);
-    const std::string widest(200, '&');
-    for (const std::size_t days : {1, 35, 100, 700})
-        for (const std::size_t marks : {0, 16, 10'000})
-            EXPECT_LE(
-                pageOf({.days = days, .applications = 60, .devices = 40, .worst = 10, .marks = marks, .name = widest})
-                    .size(),
-                mostBytesOfPage)
-                << days << " days, " << marks << " marks";
+    for (const std::size_t days : {1, 16, 35, 50, 100, 700})
+        for (const std::size_t marks : {0, 16, 25, 50, 10'000})
+            EXPECT_LE(pageOf(crowded(days, marks)).size(), mostBytesOfPage) << days << " days, " << marks << " marks";
+}
+
+TEST(ReportPage, StaysSmallOverManyYears)
+{
+    MadeReportWish wish = crowded(57 * 365, 10'000);
+    wish.first = std::chrono::year(1970) / 1 / 1;
+    wish.applications = 7; // one more than the page names
+    wish.devices = 9;
+    const auto sizeWithChangesOfClocks = [&wish] {
+        Report report = madeReport(wish);
+        for (std::size_t day = 90; day < report.days.size(); day += 182)
+            report.days[day].span.until += day % 364 == 90 ? -3600 : 3600;
+        return reportPage(report, pageHead).size();
+    };
+    EXPECT_LE(sizeWithChangesOfClocks(), mostBytesOfPage);
+    wish.days = 84'006; // to the end of 2199
+    EXPECT_LE(sizeWithChangesOfClocks(), mostBytesOfPage);
 }
 
 // --- colours

@@ -27,14 +27,37 @@ void set(Figures& figures, const std::string& name, double value)
         figures[name] = value;
 }
 
-void setAll(Figures& figures, const std::string& name, const Played& played)
+void setSums(Figures& figures, const std::string& name, const Played& played)
 {
     set(figures, name + " seconds", played.seconds);
     set(figures, name + " muted", played.mutedSeconds);
     set(figures, name + " unheard", played.unheardSeconds);
-    set(figures, name + " loudness", played.loudness);
     set(figures, name + " sessions", static_cast<double>(played.sessions));
     set(figures, name + " faults", static_cast<double>(played.faults));
+}
+
+void setAll(Figures& figures, const std::string& name, const Played& played)
+{
+    setSums(figures, name, played);
+    set(figures, name + " mean volume", played.meanVolume().value_or(0));
+    set(figures, name + " faults an hour", played.faultsAnHour().value_or(0));
+}
+
+// The rates are divided here: those of the report are what is tested.
+void setTruth(Figures& figures, const std::string& name, const Played& played)
+{
+    constexpr double least = 1e-6; // what is left of nothing by rounding
+    setSums(figures, name, played);
+    if (const double heard = played.seconds - played.mutedSeconds - played.unheardSeconds; heard > least)
+        set(figures, name + " mean volume", played.loudness / heard);
+    if (played.seconds > 0)
+        set(figures, name + " faults an hour", static_cast<double>(played.faults) / (played.seconds / 3600));
+}
+
+// One fault in a second is thousands an hour.
+double roundingOf(const std::string& name, double value)
+{
+    return name.ends_with(" mean volume") || name.ends_with(" faults an hour") ? 1e-4 * std::max(1.0, value) : 1e-3;
 }
 
 class Truth {
@@ -163,7 +186,7 @@ Figures figuresOf(const weeks::Weeks& weeks, const ZoneDays& days, const TimeSpa
     set(figures, "vanished", static_cast<double>(vanished.size()));
     set(figures, "overlapping", areAtOnce(weeks, span, isRecording) ? 1 : 0);
     const auto any = [](const weeks::Stretch&) { return true; };
-    setAll(figures, "all", truth.played(span, any));
+    setTruth(figures, "all", truth.played(span, any));
     const auto isOf = [&](const std::string& application) {
         return [&, application](const weeks::Stretch& stretch) {
             return truth.sessionOf(stretch.session).application == application;
@@ -173,12 +196,12 @@ Figures figuresOf(const weeks::Weeks& weeks, const ZoneDays& days, const TimeSpa
         return [device](const weeks::Stretch& stretch) { return stretch.devices == device; };
     };
     for (const std::string& application : applications)
-        setAll(figures, "application " + application, truth.played(span, isOf(application)));
+        setTruth(figures, "application " + application, truth.played(span, isOf(application)));
     for (const std::string& device : devices)
-        setAll(figures, "device " + keyOf(device), truth.played(span, isOn(device)));
+        setTruth(figures, "device " + keyOf(device), truth.played(span, isOn(device)));
     for (const std::string& format : formats)
-        setAll(figures, "format " + format,
-               truth.played(span, [&](const weeks::Stretch& stretch) { return stretch.format == format; }));
+        setTruth(figures, "format " + format,
+                 truth.played(span, [&](const weeks::Stretch& stretch) { return stretch.format == format; }));
     for (std::size_t index = 0; index + 1 < days.midnights.size(); ++index) {
         const TimeSpan day{.from = std::max(span.from, days.midnights[index]),
                            .until = std::min(span.until, days.midnights[index + 1])};
@@ -186,11 +209,11 @@ Figures figuresOf(const weeks::Weeks& weeks, const ZoneDays& days, const TimeSpa
             continue;
         const std::string name = "day " + dateOf(std::chrono::sys_days(days.first) + std::chrono::days(index));
         set(figures, name + " length", day.until - day.from);
-        setAll(figures, name, truth.played(day, any));
+        setTruth(figures, name, truth.played(day, any));
         for (const std::string& application : applications)
             set(figures, name + " application " + application, truth.played(day, isOf(application)).seconds);
         for (const std::string& device : devices)
-            setAll(figures, name + " device " + keyOf(device), truth.played(day, isOn(device)));
+            setTruth(figures, name + " device " + keyOf(device), truth.played(day, isOn(device)));
     }
     for (int step = 0; step < 16; ++step)
         set(figures, fmt::format("volume {}", step),
@@ -248,7 +271,6 @@ Figures figuresOf(const Report& report)
 
 std::string differences(const Figures& expected, const Figures& found)
 {
-    constexpr double rounding = 1e-3;
     std::string text;
     const auto valueIn = [](const Figures& figures, const std::string& name) {
         const auto place = figures.find(name);
@@ -259,7 +281,7 @@ std::string differences(const Figures& expected, const Figures& found)
         for (const auto& [name, value] : *figures)
             names.insert(name);
     for (const std::string& name : names)
-        if (!(std::abs(valueIn(expected, name) - valueIn(found, name)) <= rounding))
+        if (!(std::abs(valueIn(expected, name) - valueIn(found, name)) <= roundingOf(name, valueIn(expected, name))))
             text +=
                 fmt::format("{}: {} is expected, {} was found\n", name, valueIn(expected, name), valueIn(found, name));
     return text;

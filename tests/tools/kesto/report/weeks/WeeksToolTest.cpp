@@ -47,6 +47,8 @@ Figures figuresOfCsv(const std::string& csv, const std::string& table)
         figures[name + "seconds"] = std::stod(cells[1]);
         figures[name + "sessions"] = std::stod(cells[2]);
         figures[name + "faults"] = std::stod(cells[3]);
+        if (!cells[4].empty())
+            figures[name + "mean volume"] = std::stod(cells[4]);
     }
     return figures;
 }
@@ -55,7 +57,7 @@ Figures figuresOfCsv(const std::string& csv, const std::string& table)
 Figures chosen(const Figures& figures, const std::string& table)
 {
     Figures found;
-    const std::regex wanted(table + " [^ ]* (seconds|sessions|faults)");
+    const std::regex wanted(table + " [^ ]* (seconds|sessions|faults|mean volume)");
     for (const auto& [name, value] : figures)
         if (std::regex_match(name, wanted))
             found[name] = value;
