@@ -14,9 +14,9 @@
 
 std::optional<double> Played::meanVolume() const
 {
-    const double heard = seconds - mutedSeconds - unheardSeconds;
+    const double heard = seconds - mutedSeconds - noVolumeSeconds;
     constexpr double least = 1e-6; // what is left of nothing by rounding
-    return heard > least ? std::optional(loudness / heard) : std::nullopt;
+    return heard > least ? std::optional(volumeSeconds / heard) : std::nullopt;
 }
 
 std::optional<double> Played::faultsAnHour() const
@@ -49,11 +49,11 @@ struct Sum {
         played.sessions += meets(piece.session) ? 1 : 0;
         played.seconds += seconds;
         if (!piece.volume)
-            played.unheardSeconds += seconds;
+            played.noVolumeSeconds += seconds;
         else if (*piece.volume == 0)
             played.mutedSeconds += seconds;
         else
-            played.loudness += seconds * *piece.volume;
+            played.volumeSeconds += seconds * *piece.volume;
     }
 };
 

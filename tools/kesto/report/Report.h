@@ -17,8 +17,8 @@
 struct Played {
     double seconds = 0; // with all of the next three
     double mutedSeconds = 0; // at volume 0
-    double unheardSeconds = 0; // by streams that told no volume
-    double loudness = 0; // the integral of the volume over the time that was neither
+    double noVolumeSeconds = 0; // by streams that told no volume
+    double volumeSeconds = 0; // the integral of the volume over the time that was neither
     std::size_t sessions = 0;
     std::size_t faults = 0;
 

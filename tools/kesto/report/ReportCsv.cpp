@@ -58,7 +58,7 @@ std::string volumes(const Report& report)
     table.add("muted", secondsText(report.all.mutedSeconds));
     for (const auto& [upTo, seconds] : volumeSteps(report))
         table.add(decimalText(upTo, decimals), secondsText(seconds));
-    table.add("", secondsText(report.all.unheardSeconds));
+    table.add("", secondsText(report.all.noVolumeSeconds));
     return table.take();
 }
 

@@ -20,7 +20,7 @@ Dictionary::Entries figures(const Played& played)
 {
     return {{"seconds", played.seconds},
             {"muted_seconds", played.mutedSeconds},
-            {"no_volume_seconds", played.unheardSeconds},
+            {"no_volume_seconds", played.noVolumeSeconds},
             {"mean_volume", valueOf(played.meanVolume())},
             {"sessions", played.sessions},
             {"faults", played.faults},

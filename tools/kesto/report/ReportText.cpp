@@ -3,9 +3,9 @@
 
 #include "foundation/text/LocalTime.h"
 #include "kesto/Terminal.h"
+#include "kesto/report/ReportWords.h"
 
 #include <algorithm>
-#include <array>
 #include <fmt/format.h>
 #include <utility>
 
@@ -34,11 +34,6 @@ std::string percentText(double share)
 {
     constexpr double hundred = 100;
     return fmt::format("{:.0f} %", share * hundred);
-}
-
-std::string counted(std::size_t count, std::string_view thing)
-{
-    return fmt::format("{} {}{}", count, thing, count == 1 ? "" : "s");
 }
 
 // Nothing of so short a time that one fault would be hundreds an hour.
@@ -160,8 +155,8 @@ private:
     {
         const std::string_view dot = layout_.isUTF8 ? " · " : "; ";
         std::string text = fmt::format("{} {} in {}{}", durationText(report_.all.seconds), done(),
-                                       counted(report_.all.sessions, "session"), dot);
-        text += report_.all.faults == 0 ? "no faults" : counted(report_.all.faults, "fault");
+                                       countText(report_.all.sessions, "session"), dot);
+        text += report_.all.faults == 0 ? "no faults" : countText(report_.all.faults, "fault");
         if (const std::string rate = rateText(report_.all); !rate.empty() && report_.all.faults != 0)
             text += fmt::format(", {} an hour", rate);
         std::string ends = report_.vanished == 0 ? std::string() : fmt::format("{} vanished", report_.vanished);
@@ -199,9 +194,7 @@ private:
 
     static std::string dayName(std::chrono::year_month_day date)
     {
-        constexpr std::array<std::string_view, 7> names{"Sun", "Mon", "Tue", "Wed", "Thu", "Fri", "Sat"};
-        const std::chrono::weekday weekday{std::chrono::sys_days(date)};
-        return fmt::format("{} {}", names[weekday.c_encoding()], unsigned{date.day()});
+        return fmt::format("{} {}", weekdayName(date), unsigned{date.day()});
     }
 
     [[nodiscard]] std::string shareText(double seconds) const
@@ -245,8 +238,8 @@ private:
             add("muted", report_.all.mutedSeconds);
         for (const auto& [upTo, seconds] : volumeSteps(report_))
             add(fmt::format("to {:.4g} %", upTo * 100), seconds);
-        if (report_.all.unheardSeconds > 0)
-            add("(unknown)", report_.all.unheardSeconds);
+        if (report_.all.noVolumeSeconds > 0)
+            add("(unknown)", report_.all.noVolumeSeconds);
         return table.text(layout_);
     }
 
@@ -266,8 +259,8 @@ private:
         if (report_.all.mutedSeconds > 0)
             text +=
                 fmt::format("{} of it muted, which no mean volume counts\n", durationText(report_.all.mutedSeconds));
-        if (report_.all.unheardSeconds > 0)
-            text += fmt::format("{} of it by streams that told no volume\n", durationText(report_.all.unheardSeconds));
+        if (report_.all.noVolumeSeconds > 0)
+            text += fmt::format("{} of it by streams that told no volume\n", durationText(report_.all.noVolumeSeconds));
         if (report_.isOverlapping)
             text += "streams at the same time each count: a day may have more than 24 h\n";
         return text;

@@ -44,11 +44,11 @@ void addTo(Played& played, const PlayedStretch& stretch)
 {
     played.seconds += stretch.seconds;
     if (!stretch.volume)
-        played.unheardSeconds += stretch.seconds;
+        played.noVolumeSeconds += stretch.seconds;
     else if (*stretch.volume == 0)
         played.mutedSeconds += stretch.seconds;
     else
-        played.loudness += stretch.seconds * *stretch.volume;
+        played.volumeSeconds += stretch.seconds * *stretch.volume;
 }
 
 std::string_view name(SessionEnd end)

@@ -64,7 +64,7 @@ Dictionary::Entries entries(const SessionLine& line)
             {"process_id", valueOf(session.processID)},
             {"seconds", played.seconds},
             {"muted_seconds", played.mutedSeconds},
-            {"no_volume_seconds", played.unheardSeconds},
+            {"no_volume_seconds", played.noVolumeSeconds},
             {"device", known(devices)},
             {"mean_volume", valueOf(played.meanVolume())},
             {"faults", played.faults},

@@ -125,7 +125,7 @@ TEST(ReportOfHistory, WeighsVolumesByTimeAndLeavesOutMutedAndUnknown)
                                               stretch(1, 400, 50, 0.0), stretch(2, 450, 25, std::nullopt)}));
     EXPECT_EQ(report.all.seconds, 475);
     EXPECT_EQ(report.all.mutedSeconds, 50);
-    EXPECT_EQ(report.all.unheardSeconds, 25);
+    EXPECT_EQ(report.all.noVolumeSeconds, 25);
     EXPECT_THAT(report.all.meanVolume(), Optional(DoubleEq(0.5)));
     EXPECT_EQ(reportOf(historyOf({stretch(1, 0, 100, 0.0)})).all.meanVolume(), std::nullopt);
     EXPECT_EQ(reportOf(historyOf({stretch(1, 0, 100, std::nullopt)})).all.meanVolume(), std::nullopt);
@@ -292,7 +292,7 @@ TEST(ReportOfHistory, TakesTimesThatNoClockShows)
                   {fault(1, nan), fault(1, infinity), fault(1, -1e300), fault(1, 1e300)}),
         {.from = 0, .until = 864'000});
     EXPECT_EQ(report.all.seconds, 864'030) << "of the session 7, and those after it";
-    EXPECT_EQ(report.all.unheardSeconds, 20);
+    EXPECT_EQ(report.all.noVolumeSeconds, 20);
     EXPECT_EQ(report.all.mutedSeconds, 10);
     EXPECT_EQ(report.all.faults, 0U);
     EXPECT_THAT(report.days, SizeIs(10));

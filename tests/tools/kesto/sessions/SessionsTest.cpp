@@ -76,7 +76,7 @@ TEST_F(Sessions, SumUpTheirStretchesAndFaults)
     ASSERT_EQ(all.size(), 3U);
     EXPECT_EQ(all[0].played.seconds, 70);
     EXPECT_EQ(all[0].played.mutedSeconds, 10);
-    EXPECT_EQ(all[0].played.unheardSeconds, 20);
+    EXPECT_EQ(all[0].played.noVolumeSeconds, 20);
     EXPECT_EQ(all[0].played.meanVolume(), 0.625) << "10 s at 1 and 30 s at 0.5";
     EXPECT_EQ(all[0].played.faults, 2U);
     EXPECT_EQ(all[0].devices, "headset; speaker");

@@ -19,8 +19,8 @@ ReportLine othersOf(const std::vector<ReportLine>& lines, std::size_t named)
         const Played& played = lines[index].played;
         others.played.seconds += played.seconds;
         others.played.mutedSeconds += played.mutedSeconds;
-        others.played.unheardSeconds += played.unheardSeconds;
-        others.played.loudness += played.loudness;
+        others.played.noVolumeSeconds += played.noVolumeSeconds;
+        others.played.volumeSeconds += played.volumeSeconds;
         others.played.faults += played.faults;
     }
     return others;

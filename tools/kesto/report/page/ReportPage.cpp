@@ -66,9 +66,9 @@ std::string tiles(const Report& report, const PageWords& words)
     html += tile(fmt::format("{}", all.faults),
                  fmt::format("fault{}{}", all.faults == 1 ? "" : "s",
                              rate ? fmt::format(", {} an hour of {}", rateText(rate), words.playing()) : ""));
-    const std::size_t without = all.sessions - std::min(all.sessions, report.withFaults);
-    html += tile(all.sessions == 0 ? "–" : percentText(static_cast<double>(without), static_cast<double>(all.sessions)),
-                 "of sessions without a fault");
+    html += tile(
+        all.sessions == 0 ? "–" : percentText(static_cast<double>(report.faultless), static_cast<double>(all.sessions)),
+        "of sessions without a fault");
     return html + "</dl>";
 }
 
@@ -90,9 +90,9 @@ std::string footer(const Report& report, const PageHead& head, const PageWords& 
             fmt::format("<p>{} vanished: the connection of the client ended without a word. What was told until then "
                         "counts.</p>",
                         countText(report.vanished, "session"));
-    if (report.all.unheardSeconds > 0)
+    if (report.all.noVolumeSeconds > 0)
         html += fmt::format("<p>{} were {} by streams that told no volume: Volume leaves them out.</p>",
-                            durationText(report.all.unheardSeconds), words.played());
+                            durationText(report.all.noVolumeSeconds), words.played());
     if (report.isOverlapping)
         html +=
             "<p>Some streams ran at the same time, and each counts: a day can have more hours of sound than of time."

@@ -104,14 +104,14 @@ std::string volumeSection(const Report& report, const PageWords& words)
 {
     std::string html = "<section><h2>Volume</h2><p class=sub>How long it was how loud</p>";
     const Played& all = report.all;
-    if (all.seconds - all.unheardSeconds <= 0)
+    if (all.seconds - all.noVolumeSeconds <= 0)
         return html + "<p class=none>No stream told its volume.</section>";
     html += Histogram(report, words).draw();
     PageTable table{.summary = "Volume as a table", .head = {"Volume", "Hours"}, .rows = {}};
     table.rows.push_back({"muted", hoursText(all.mutedSeconds)});
     for (std::size_t step = 0; step < Report::volumeSteps; ++step)
         table.rows.push_back({stepText(step), hoursText(report.secondsAtVolume[step])});
-    if (all.unheardSeconds > 0)
-        table.rows.push_back({"not told", hoursText(all.unheardSeconds)});
+    if (all.noVolumeSeconds > 0)
+        table.rows.push_back({"not told", hoursText(all.noVolumeSeconds)});
     return html + tableHTML(table) + "</section>";
 }

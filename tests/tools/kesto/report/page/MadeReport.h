@@ -26,8 +26,8 @@ inline Played madePlayed(double seconds, std::size_t faults)
 {
     return {.seconds = seconds,
             .mutedSeconds = seconds / 20,
-            .unheardSeconds = seconds / 10,
-            .loudness = seconds * 0.85 * 0.5, // so the mean is 0.5
+            .noVolumeSeconds = seconds / 10,
+            .volumeSeconds = seconds * 0.85 * 0.5, // so the mean is 0.5
             .sessions = 2,
             .faults = faults};
 }
@@ -110,6 +110,7 @@ inline Report madeReport(const MadeReportWish& wish = {})
     report.all = madePlayed(report.all.seconds, faults);
     report.all.sessions = 50;
     report.withFaults = 4;
+    report.faultless = 46;
     for (std::size_t step = 0; step < Report::volumeSteps; ++step)
         report.secondsAtVolume[step] = hour * static_cast<double>(8 - std::min(step > 7 ? step - 7 : 7 - step, 8UL));
     for (std::size_t index = 0; index < wish.worst; ++index)

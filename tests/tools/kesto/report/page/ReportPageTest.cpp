@@ -64,7 +64,7 @@ TEST(ReportPage, BeginsWithTheMainFigures)
     report.all.seconds = 131.5 * 3600;
     report.all.faults = 73;
     report.all.sessions = 589;
-    report.withFaults = 41;
+    report.faultless = 548;
     report.running = 1;
     const std::string page = reportPage(report, pageHead);
     EXPECT_THAT(page, HasSubstr("<dt>played, 9 h 24 min a day</dt><dd>132 h</dd>"));
@@ -125,7 +125,7 @@ TEST(ReportPage, TellsHowLongItWasHowLoud)
 TEST(ReportPage, SaysThatNoVolumeWasTold)
 {
     Report report = madeReport();
-    report.all.unheardSeconds = report.all.seconds;
+    report.all.noVolumeSeconds = report.all.seconds;
     EXPECT_THAT(sectionOf(reportPage(report, pageHead), "Volume"), HasSubstr("No stream told its volume."));
 }
 
@@ -200,14 +200,14 @@ TEST(ReportPage, SaysWhatIsLeftOut)
     Report report = madeReport();
     report.vanished = 12;
     report.isOverlapping = true;
-    report.all.unheardSeconds = 84 * 60;
+    report.all.noVolumeSeconds = 84 * 60;
     const std::string page = reportPage(report, pageHead);
     EXPECT_THAT(page, HasSubstr("<p>12 sessions vanished: "));
     EXPECT_THAT(page, HasSubstr("<p>1 h 24 min were played by streams that told no volume"));
     EXPECT_THAT(page, HasSubstr("<p>Some streams ran at the same time, and each counts"));
     report.vanished = 0;
     report.isOverlapping = false;
-    report.all.unheardSeconds = 0;
+    report.all.noVolumeSeconds = 0;
     EXPECT_THAT(reportPage(report, pageHead),
                 AllOf(Not(HasSubstr("vanished: ")), Not(HasSubstr("told no volume")), Not(HasSubstr("same time"))));
 }

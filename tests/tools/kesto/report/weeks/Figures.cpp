@@ -31,7 +31,7 @@ void setSums(Figures& figures, const std::string& name, const Played& played)
 {
     set(figures, name + " seconds", played.seconds);
     set(figures, name + " muted", played.mutedSeconds);
-    set(figures, name + " unheard", played.unheardSeconds);
+    set(figures, name + " unheard", played.noVolumeSeconds);
     set(figures, name + " sessions", static_cast<double>(played.sessions));
     set(figures, name + " faults", static_cast<double>(played.faults));
 }
@@ -48,8 +48,8 @@ void setTruth(Figures& figures, const std::string& name, const Played& played)
 {
     constexpr double least = 1e-6; // what is left of nothing by rounding
     setSums(figures, name, played);
-    if (const double heard = played.seconds - played.mutedSeconds - played.unheardSeconds; heard > least)
-        set(figures, name + " mean volume", played.loudness / heard);
+    if (const double heard = played.seconds - played.mutedSeconds - played.noVolumeSeconds; heard > least)
+        set(figures, name + " mean volume", played.volumeSeconds / heard);
     if (played.seconds > 0)
         set(figures, name + " faults an hour", static_cast<double>(played.faults) / (played.seconds / 3600));
 }
@@ -79,8 +79,8 @@ public:
             sessions.insert(stretch.session);
             played.seconds += seconds;
             played.mutedSeconds += stretch.volume == 0.0 ? seconds : 0;
-            played.unheardSeconds += stretch.volume ? 0 : seconds;
-            played.loudness += stretch.volume.value_or(0) * seconds;
+            played.noVolumeSeconds += stretch.volume ? 0 : seconds;
+            played.volumeSeconds += stretch.volume.value_or(0) * seconds;
         }
         played.sessions = sessions.size();
         for (const weeks::Fault& fault : weeks_.faults)
