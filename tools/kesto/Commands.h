@@ -13,6 +13,10 @@
 void requireSubcommand(CLI::App& application);
 // For a number of things to show, of which none would make no sense.
 [[nodiscard]] CLI::Validator atLeastOne();
+// For the seconds between two looks: from `shortestWait` to `longestWait`.
+constexpr double shortestWait = 0.01;
+constexpr double longestWait = 86'400;
+[[nodiscard]] CLI::Validator secondsToWait();
 
 void addBugsCommand(CLI::App& application, int& exitStatus);
 void addChannelsCommand(CLI::App& application, int& exitStatus);

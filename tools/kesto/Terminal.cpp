@@ -1,6 +1,7 @@
 // Characters are counted by their first bytes in UTF-8, even if the other bytes are wrong.
 #include "kesto/Terminal.h"
 
+#include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "platform/linux/process/Environment.h"
 
@@ -89,6 +90,11 @@ std::string alignedRight(std::string_view text, std::size_t columns)
 {
     const std::size_t width = columnsOf(text);
     return std::string(columns > width ? columns - width : 0, ' ').append(text);
+}
+
+std::string momentText(double secondsSince1970)
+{
+    return foundation::localTimeText(secondsSince1970, "{:%Y-%m-%d %H:%M:%S}");
 }
 
 std::size_t outputWidth()

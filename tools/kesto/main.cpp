@@ -6,8 +6,10 @@
 #include <cstdint>
 #include <cstdio>
 #include <exception>
+#include <fcntl.h>
 #include <stdexcept>
 #include <string>
+#include <unistd.h>
 
 void requireSubcommand(CLI::App& application)
 {
@@ -30,8 +32,37 @@ CLI::Validator atLeastOne()
         "");
 }
 
+// "nan" is a number, too, and compares with none.
+CLI::Validator secondsToWait()
+{
+    return CLI::Validator(
+        [](const std::string& text) {
+            double seconds = 0;
+            const char* const end = text.data() + text.size();
+            const bool isNumber = std::from_chars(text.data(), end, seconds).ptr == end;
+            return isNumber && seconds >= shortestWait && seconds <= longestWait
+                ? std::string()
+                : "\"" + text + "\" is not a number from 0.01 to 86400";
+        },
+        "");
+}
+
+namespace {
+
+// Where the caller has closed one of the three, the next file or socket would get its number, and what is printed would
+// go there. Standard output gets a file that cannot be written, so that a lost output is a failure.
+void fillStandardDescriptors()
+{
+    for (const int number : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO})
+        if (::fcntl(number, F_GETFD) < 0)
+            ::open("/dev/null", number == STDERR_FILENO ? O_WRONLY : O_RDONLY); // stays open under that number
+}
+
+} // namespace
+
 int main(int argumentCount, char** arguments)
 {
+    fillStandardDescriptors();
     CLI::App application("Calls the audio reporting service and shows its results.", "kesto");
     application.set_version_flag("--version", "kesto " KESTO_VERSION);
     requireSubcommand(application);

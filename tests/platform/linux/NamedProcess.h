@@ -3,6 +3,7 @@
 
 #include <csignal>
 #include <gtest/gtest.h>
+#include <stdexcept>
 #include <string>
 #include <sys/prctl.h>
 #include <sys/wait.h>
@@ -18,6 +19,8 @@ public:
         EXPECT_EQ(::pipe(toChild_), 0);
         EXPECT_EQ(::pipe(fromChild_), 0);
         identifier_ = ::fork();
+        if (identifier_ < 0)
+            throw std::runtime_error("no process");
         if (identifier_ == 0) {
             char next[17] = {};
             while (::read(toChild_[0], next, 16) == 16) {

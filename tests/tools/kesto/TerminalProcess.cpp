@@ -34,6 +34,8 @@ TerminalProcess::TerminalProcess(const sdk_test::Process::Arguments& arguments,
     std::vector<char*> argumentPointers = sdk_test::pointersTo(argumentTexts);
     std::vector<char*> environmentPointers = sdk_test::pointersTo(environmentTexts);
     identifier_ = ::fork();
+    if (identifier_ < 0)
+        throw std::runtime_error("no process");
     if (identifier_ == 0) {
         for (int number = 1; number < NSIG; ++number)
             ::signal(number, SIG_DFL); // the test may have been told to ignore some
@@ -66,17 +68,21 @@ void TerminalProcess::resize(unsigned short columns, unsigned short lines) const
 
 void TerminalProcess::signal(int number) const
 {
-    ::kill(identifier_, number);
+    if (identifier_ > 0) // else a whole group of processes would get it
+        ::kill(identifier_, number);
 }
 
-void TerminalProcess::read()
+bool TerminalProcess::read()
 {
     constexpr int shortWait = 2; // milliseconds
     pollfd readable{master_.get(), POLLIN, 0};
     std::array<char, 65536> buffer{};
     if (master_ && ::poll(&readable, 1, shortWait) == 1 && (readable.revents & POLLIN) != 0)
-        if (const ssize_t count = ::read(master_.get(), buffer.data(), buffer.size()); count > 0)
+        if (const ssize_t count = ::read(master_.get(), buffer.data(), buffer.size()); count > 0) {
             output_.append(buffer.data(), static_cast<std::size_t>(count));
+            return true;
+        }
+    return false;
 }
 
 bool TerminalProcess::waitFor(std::string_view text)
@@ -107,7 +113,7 @@ std::optional<int> TerminalProcess::wait()
         }))
         return std::nullopt;
     identifier_ = 0;
-    read();
+    while (read()) { }
     return WIFEXITED(status) ? WEXITSTATUS(status) : 128 + WTERMSIG(status);
 }
 

@@ -37,8 +37,8 @@ public:
     [[nodiscard]] pid_t identifier() const { return identifier_; }
 
 private:
-    // What is there, after a short wait for it.
-    void read();
+    // A part of what is there, after a short wait for it; false if there is nothing.
+    bool read();
 
     platform::FileDescriptor master_;
     platform::FileDescriptor slave_; // keeps what was written for the test after the program has ended

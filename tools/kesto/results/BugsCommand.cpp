@@ -1,5 +1,4 @@
 // `kesto bugs`: the bugs that the service captured, as a table, or one with all its details.
-#include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
 #include "kesto/ServiceDirectories.h"
@@ -29,11 +28,6 @@ constexpr std::size_t timeColumns = 19;
 constexpr std::size_t sizeColumns = 10;
 constexpr std::size_t processColumns = 16;
 
-std::string timeText(double time)
-{
-    return foundation::localTimeText(time, "{:%Y-%m-%d %H:%M:%S}");
-}
-
 // "-" for a tombstone.
 std::string sizeText(const std::optional<std::uint64_t>& bytes)
 {
@@ -60,7 +54,7 @@ void printTable(const std::vector<CapturedBug>& captures)
     fmt::print("{:>{}} {} {:>{}} {} {}\n", "NUMBER", numberColumns, padded("TIME", timeColumns), "STATE", sizeColumns,
                padded("PROCESS", processColumns), "BUG");
     for (const CapturedBug& capture : captures)
-        fmt::print("{:>{}} {} {:>{}} {} {}\n", capture.number, numberColumns, timeText(capture.time),
+        fmt::print("{:>{}} {} {:>{}} {} {}\n", capture.number, numberColumns, momentText(capture.time),
                    sizeText(capture.bytes), sizeColumns,
                    padded(fitted(entryText(capture.signature, "detectedProcess"), processColumns), processColumns),
                    fitted(bugText(capture.signature),
@@ -123,7 +117,7 @@ void printBelow(const Value& value, std::size_t indent)
 
 void printWhole(const CapturedBug& capture)
 {
-    fmt::print("bug {} of {}\n{}\n\n", capture.number, timeText(capture.time), printable(capture.directory.native()));
+    fmt::print("bug {} of {}\n{}\n\n", capture.number, momentText(capture.time), printable(capture.directory.native()));
     printEntry("signature", capture.signature, 0);
     printEntry("response", capture.response, 0);
     if (!capture.bytes)

@@ -279,8 +279,6 @@ private:
 
 void addChannelsCommand(CLI::App& application, int& exitStatus)
 {
-    constexpr double shortestInterval = 0.01;
-    constexpr double longestInterval = 86'400;
     const auto options = std::make_shared<ChannelsOptions>();
     CLI::App* command =
         application.add_subcommand("channels", "Lists the channels of drivers, or watches their changes");
@@ -289,8 +287,8 @@ void addChannelsCommand(CLI::App& application, int& exitStatus)
     command->add_option("--group", options->selection.group, "Only channels of this group");
     command->add_option("--subgroup", options->selection.subgroup, "Only channels of this subgroup");
     CLI::Option* watch = command->add_flag("--watch", options->isWatching, "Go on, and print changes");
-    command->add_option("--interval", options->interval, "Seconds between two samples; 1 by default")
-        ->check(CLI::Range(shortestInterval, longestInterval))
+    command->add_option("--interval", options->interval, "Seconds between two samples, 0.01 to 86400; 1 by default")
+        ->check(secondsToWait())
         ->needs(watch);
     command->add_option("--count", options->count, "End after this many intervals")
         ->check(CLI::NonNegativeNumber)

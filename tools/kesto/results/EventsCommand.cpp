@@ -1,5 +1,4 @@
 // `kesto events`: the stored events, as a table for people or as JSON lines for programs, and on request future events.
-#include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"
 #include "kesto/ServiceDirectories.h"
@@ -59,8 +58,7 @@ private:
     {
         if (!std::isfinite(time))
             return "?";
-        return foundation::localTimeText(time, "{:%Y-%m-%d %H:%M:%S}")
-            + fmt::format(".{:03}", static_cast<int>((time - std::floor(time)) * 1000));
+        return momentText(time) + fmt::format(".{:03}", static_cast<int>((time - std::floor(time)) * 1000));
     }
 
     // "key=value key=value", without the application, which has a column of its own.

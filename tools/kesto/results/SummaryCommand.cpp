@@ -1,5 +1,4 @@
 // `kesto summary`: the file that a session leaves on internal builds, as a timeline that a person can read.
-#include "foundation/text/LocalTime.h"
 #include "kesto/Commands.h"
 #include "kesto/Terminal.h"
 #include "kesto/files/InputFile.h"
@@ -115,8 +114,7 @@ private:
     {
         fmt::print("\n{} message{}", timeline_.messages(), timeline_.messages() == 1 ? "" : "s");
         if (timeline_.start())
-            fmt::print(" in {} from {}", clockText(timeline_.end()),
-                       foundation::localTimeText(*timeline_.start(), "{:%Y-%m-%d %H:%M:%S}"));
+            fmt::print(" in {} from {}", clockText(timeline_.end()), momentText(*timeline_.start()));
         fmt::print("\n");
         showStretches("played", timeline_.played());
         showStretches("recorded", timeline_.recorded());

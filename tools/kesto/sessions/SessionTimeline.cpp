@@ -2,7 +2,6 @@
 // happened in its part.
 #include "kesto/sessions/SessionTimeline.h"
 
-#include "foundation/text/LocalTime.h"
 #include "kesto/Terminal.h"
 #include "kesto/sessions/SessionText.h"
 #include "ledger/Report.h"
@@ -20,11 +19,6 @@ constexpr std::size_t usualWidth = 80;
 constexpr std::size_t labelColumns = 9;
 constexpr std::array<std::string_view, 8> blocks{"▁", "▂", "▃", "▄", "▅", "▆", "▇", "█"};
 constexpr std::array<std::string_view, 8> digits{"1", "2", "3", "4", "5", "6", "7", "8"};
-
-std::string momentText(double time)
-{
-    return foundation::localTimeText(time, "{:%Y-%m-%d %H:%M:%S}");
-}
 
 class Timeline {
 public:

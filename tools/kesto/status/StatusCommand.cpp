@@ -100,8 +100,6 @@ private:
 
 void addStatusCommand(CLI::App& application, int& exitStatus)
 {
-    constexpr double shortestInterval = 0.01;
-    constexpr double longestInterval = 86'400;
     const auto options = std::make_shared<StatusOptions>();
     CLI::App* command =
         application.add_subcommand("status", "Shows what the service counted, and what it lost and why");
@@ -114,8 +112,8 @@ void addStatusCommand(CLI::App& application, int& exitStatus)
         command->add_flag("--watch", options->isWatching, "Go on, and show the status again and again");
     json->excludes(metrics);
     metrics->excludes(watch);
-    command->add_option("--interval", options->interval, "Seconds between two looks; 2 by default")
-        ->check(CLI::Range(shortestInterval, longestInterval))
+    command->add_option("--interval", options->interval, "Seconds between two looks, 0.01 to 86400; 2 by default")
+        ->check(secondsToWait())
         ->needs(watch);
     command->add_option("--count", options->count, "End after this many looks")
         ->check(CLI::NonNegativeNumber)

@@ -3,9 +3,11 @@
 #pragma once
 
 #include "foundation/values/Value.h"
+#include "platform/linux/connection/FrameReader.h"
 #include "platform/linux/files/FileDescriptor.h"
 
 #include <filesystem>
+#include <optional>
 #include <stdexcept>
 #include <string>
 #include <string_view>
@@ -31,18 +33,21 @@ public:
     {
     }
 
-    // Asks the service, for a caller that waits for other things, too: `read` does not wait once this descriptor can be
-    // read. -1: it need not wait at all. Throws StatusError.
+    // Asks the service without waiting for it. The answer is there when this descriptor can be read; -1: there is
+    // nothing to wait for. Throws StatusError.
     [[nodiscard]] int request();
-    // The report (`ledger::report`) of the service that listens at the socket; if none does, that of the ledger's file.
-    // Waits at most ten seconds for the service. Throws StatusError.
+    // What was asked for, as far as it is there: the report (`ledger::report`) of the service that listens at the
+    // socket; if none does, that of the ledger's file. Nothing: a part is still missing, or the service that was asked
+    // has ended; call `request` again. Does not wait. Throws StatusError.
+    [[nodiscard]] std::optional<foundation::Dictionary> take();
+    // Both, with a wait of at most ten seconds in between. Throws StatusError.
     [[nodiscard]] foundation::Dictionary read();
 
 private:
     [[nodiscard]] bool isConnected();
-    void ask();
-    [[nodiscard]] foundation::Dictionary answer();
-    [[nodiscard]] std::string receiveFrame();
+    [[nodiscard]] bool isAsked();
+    void disconnect();
+    [[nodiscard]] std::optional<std::string> receiveFrame();
     [[nodiscard]] foundation::Dictionary readLedger() const;
     [[nodiscard]] StatusError noAnswer(std::string_view why) const;
     [[nodiscard]] StatusError systemFailure() const;
@@ -50,5 +55,7 @@ private:
     const std::filesystem::path socket_;
     const std::filesystem::path ledgerFile_;
     platform::FileDescriptor connection_; // kept, because the service stores an event for each that ends
+    platform::FrameReader reader_; // of the answer
     bool isAsked_ = false; // over the connection, and not answered yet
+    bool hasAnswered_ = false; // over this connection, before
 };

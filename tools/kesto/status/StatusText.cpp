@@ -22,7 +22,14 @@ constexpr std::size_t numberColumns = 18;
 
 std::string moment(std::uint64_t seconds)
 {
-    return foundation::localTimeText(static_cast<double>(seconds), "{:%Y-%m-%d %H:%M:%S}");
+    return momentText(static_cast<double>(seconds));
+}
+
+// Empty if the entry is missing.
+std::string textIn(const Dictionary& entries, std::string_view key)
+{
+    const Value* const value = entries.find(key);
+    return value == nullptr ? std::string() : printable(value->text());
 }
 
 class StatusTables {
@@ -58,7 +65,7 @@ private:
     void addHead()
     {
         if (isRunning_) {
-            addLine(fmt::format("kestod {}{}, running since {}", report_.find("version")->text(),
+            addLine(fmt::format("kestod {}{}, running since {}", textIn(report_, "version"),
                                 report_.find("internalBuild")->asBoolean() ? " (internal build)" : "",
                                 moment(numberIn(report_, "started"))));
             addLine(fmt::format("{} and {} now; {} and {} in the last minute", counted("now.connections", "connection"),
@@ -77,7 +84,7 @@ private:
                             oldest == 0 ? "" : ", the oldest of " + moment(oldest)));
         if (const auto* const storing = report_.find("storing");
             isRunning_ && storing != nullptr && !storing->asBoolean())
-            addLine("no event is stored: analytics.toml says enabled = false");
+            addLine(nothingIsStored);
     }
 
     void addRow(std::string_view name, std::string_view ofRun, std::string_view ofAll, std::string_view rest = {})
@@ -158,11 +165,11 @@ private:
                     text_ += '\n';
                     addCulprit("BY WHOM", "USER", "COUNT", "PROCESS", "APPLICATION");
                 }
-                const Dictionary culprit = *each.dictionary();
+                const Dictionary culprit = each.dictionary().value_or(Dictionary());
                 const std::string count = groupedText(numberIn(culprit, "count"));
                 if (culprit.contains("user"))
-                    addCulprit(charge.view(), culprit.find("user")->text(), count, culprit.find("process")->text(),
-                               culprit.find("application")->text());
+                    addCulprit(charge.view(), textIn(culprit, "user"), count, textIn(culprit, "process"),
+                               textIn(culprit, "application"));
                 else
                     addCulprit(charge.view(), "-", count, "all others", "");
             }
@@ -176,7 +183,7 @@ private:
         constexpr std::size_t userColumns = 11;
         constexpr std::size_t processColumns = 17;
         addLine(fmt::format("{}{:>{}}{:>{}}  {}{}", padded(std::string(charge), chargeColumns), user, userColumns,
-                            count, numberColumns, padded(printable(process), processColumns), printable(application)));
+                            count, numberColumns, padded(std::string(process), processColumns), application));
     }
 
     // Only a running service knows it.
@@ -191,13 +198,12 @@ private:
         text_ += '\n';
         addWork("TIME TAKEN", "USER", "CALLS", "RECEIVED", "PROCESS, SINCE START");
         for (const Value& each : works) {
-            const Dictionary work = *each.dictionary();
+            const Dictionary work = each.dictionary().value_or(Dictionary());
             const bool hasName = work.contains("user");
             constexpr double second = 1'000'000;
             addWork(fmt::format("{:.3f} s", static_cast<double>(numberIn(work, "microseconds")) / second),
-                    hasName ? work.find("user")->text() : "-", groupedText(numberIn(work, "calls")),
-                    sizeText(numberIn(work, "bytes")),
-                    hasName ? printable(work.find("process")->text()) : "all others");
+                    hasName ? textIn(work, "user") : "-", groupedText(numberIn(work, "calls")),
+                    sizeText(numberIn(work, "bytes")), hasName ? textIn(work, "process") : "all others");
         }
     }
 

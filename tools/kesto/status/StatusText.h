@@ -5,6 +5,10 @@
 
 #include <cstddef>
 #include <string>
+#include <string_view>
+
+// What a person reads while `enabled = false` stands there.
+constexpr std::string_view nothingIsStored = "no event is stored: analytics.toml says enabled = false";
 
 // Tables of what the service counted, cut to the width.
 [[nodiscard]] std::string statusText(const foundation::Dictionary& report, std::size_t width);

@@ -35,6 +35,7 @@ std::vector<PlayingStream> PlayingStreams::read()
         streams = readOpen();
         readEnded();
         readFaults();
+        forgetEndedSessions();
         seen_ = database_->number("SELECT next_event - 1 FROM store");
         database_->execute("COMMIT");
         for (PlayingStream& stream : streams) {
@@ -97,4 +98,13 @@ void PlayingStreams::readFaults()
         "SELECT session FROM events WHERE {}name GLOB 'com.quarn.kesto.Error.*' AND id > ?1", seen_ == 0 ? "" : "+"));
     statement.bind(1, seen_);
     database_->forEachRow(statement, [this](const SqliteStatement& row) { ++faults_[row.integer(0)]; });
+}
+
+void PlayingStreams::forgetEndedSessions()
+{
+    std::erase_if(faults_, [this](const auto& entry) {
+        return database_->number(
+                   fmt::format("SELECT count(*) FROM sessions WHERE id = {} AND ended IS NULL", entry.first))
+            == 0;
+    });
 }

@@ -39,10 +39,11 @@ private:
     [[nodiscard]] std::vector<PlayingStream> readOpen();
     void readEnded();
     void readFaults();
+    void forgetEndedSessions();
 
     const std::filesystem::path path_;
     std::optional<EventDatabase> database_; // none: it did not exist yet
     std::int64_t seen_ = 0; // nothing with this ID or a lower one is new
     std::map<Key, double> began_; // when what went over into a stretch that is open began
-    std::map<std::int64_t, std::uint64_t> faults_; // by session
+    std::map<std::int64_t, std::uint64_t> faults_; // by session, of those that have not ended
 };

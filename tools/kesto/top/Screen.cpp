@@ -32,7 +32,8 @@ sigset_t takenSignals()
 {
     sigset_t set;
     ::sigemptyset(&set);
-    for (const int signal : {SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGTSTP, SIGTTOU, SIGCONT, SIGWINCH}) {
+    for (const int signal : {SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGUSR1, SIGUSR2, SIGALRM, SIGVTALRM, SIGPROF, SIGXCPU,
+                             SIGPWR, SIGIO, SIGTSTP, SIGTTOU, SIGCONT, SIGWINCH}) {
         struct sigaction action{};
         if (::sigaction(signal, nullptr, &action) == 0 && action.sa_handler != SIG_IGN)
             ::sigaddset(&set, signal);
@@ -105,8 +106,8 @@ void Screen::stop(int signal) const noexcept
     ::pthread_sigmask(SIG_BLOCK, &set, nullptr);
 }
 
-// What the terminal does not take in time, or before a signal comes, which may be the end, is left out. False if the
-// terminal is gone.
+// What the terminal does not take in time is left out; without a limit, what it does not take before a signal comes,
+// which may be the end. False if the terminal is gone.
 bool Screen::write(std::string_view text, int longestWait) const noexcept
 {
     while (!text.empty()) {
@@ -117,7 +118,8 @@ bool Screen::write(std::string_view text, int longestWait) const noexcept
         }
         if (count < 0 && errno != EAGAIN && errno != EINTR)
             return false;
-        std::array<pollfd, 2> room{{{output_.get(), POLLOUT, 0}, {signals_.get(), POLLIN, 0}}};
+        std::array<pollfd, 2> room{
+            {{output_.get(), POLLOUT, 0}, {longestWait == forEver ? signals_.get() : -1, POLLIN, 0}}};
         if (::poll(room.data(), room.size(), longestWait) == 0 || room[1].revents != 0)
             break;
     }

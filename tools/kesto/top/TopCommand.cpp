@@ -1,7 +1,7 @@
 // `kesto top`: what plays now and what the service does, again and again.
 //
-// The screen asks only while somebody can see it: not in a pause, and not while the program is stopped or in the
-// background.
+// The screen asks only while somebody can see it: not in a pause or under the list of keys, and not while the program
+// is stopped or in the background.
 #include "kesto/Commands.h"
 #include "kesto/ServiceDirectories.h"
 #include "kesto/Terminal.h"
@@ -32,9 +32,6 @@ namespace {
 
 using Clock = std::chrono::steady_clock;
 using Seconds = std::chrono::duration<double>;
-
-constexpr double shortestDelay = 0.01;
-constexpr double longestDelay = 86'400;
 
 struct TopOptions {
     std::filesystem::path socket;
@@ -82,30 +79,28 @@ public:
     {
     }
 
-    // As `StatusSource::request`.
+    // The descriptor to wait for before `take`; -1: there is a new look already.
     int request()
     {
-        try {
-            return status_.request();
-        } catch (const StatusError&) {
-            return -1; // reading it says the same
-        }
+        int descriptor = -1;
+        lookWith([&] {
+            descriptor = status_.request();
+            return descriptor < 0 ? status_.take() : std::nullopt;
+        });
+        return descriptor;
     }
 
-    // What plays is known of a service that runs only: what a killed one left in its store plays no more.
+    // False if the answer is not there yet: `request` again.
+    bool take()
+    {
+        return lookWith([this] { return status_.take(); });
+    }
+
+    // Waits for the answer.
     const TopLook& read()
     {
-        TopLook look;
-        try {
-            look.status = status_.read();
-        } catch (const StatusError& error) {
-            look.statusProblem = error.what();
-        }
-        look.time = Seconds(std::chrono::system_clock::now().time_since_epoch()).count();
-        look.rates = ratesOf(look, look_ ? &*look_ : nullptr);
-        if (look.isRunning())
-            readStreams(look);
-        return look_.emplace(std::move(look));
+        lookWith([this] { return std::optional(status_.read()); });
+        return *look_;
     }
 
     [[nodiscard]] const std::optional<TopLook>& look() const noexcept { return look_; }
@@ -115,6 +110,26 @@ public:
     }
 
 private:
+    // False if there is neither a status nor an error yet.
+    template <typename Ask> bool lookWith(Ask ask)
+    {
+        TopLook look;
+        try {
+            look.status = ask();
+            if (!look.status)
+                return false;
+        } catch (const StatusError& error) {
+            look.statusProblem = error.what();
+        }
+        look.time = Seconds(std::chrono::system_clock::now().time_since_epoch()).count();
+        look.steadyTime = Seconds(Clock::now().time_since_epoch()).count();
+        look.rates = ratesOf(look, look_ ? &*look_ : nullptr);
+        if (look.isStoring())
+            readStreams(look);
+        look_ = std::move(look);
+        return true;
+    }
+
     void readStreams(TopLook& look)
     {
         try {
@@ -128,6 +143,12 @@ private:
     PlayingStreams streams_;
     std::optional<TopLook> look_;
 };
+
+void printLines(const std::vector<std::string>& lines)
+{
+    for (const std::string& line : lines)
+        fmt::print("{}\n", line);
+}
 
 // --- One look after the other, for programs and for files
 
@@ -158,9 +179,7 @@ private:
         }
         if (isLater)
             fmt::print("\n");
-        const TopStyle style{.width = outputWidth(), .isUTF8 = showsUTF8()};
-        for (const std::string& line : topLines(look, {}, style))
-            fmt::print("{}\n", line);
+        printLines(topLines(look, {}, {.width = outputWidth(), .isUTF8 = showsUTF8()}));
     }
 
     const TopOptions& options_;
@@ -179,14 +198,17 @@ public:
     {
     }
 
-    // A signal ends the program as it would have without a screen; one that is ignored, with a failure.
+    // A signal ends the program as it would have without a screen; one that is ignored, with a failure. The last of so
+    // many looks stays on the terminal.
     int run()
     {
-        const auto signal = showUntilTheEnd();
-        if (!signal)
-            return source_.exitStatus();
-        ::raise(*signal);
-        return exitFailure;
+        if (const auto signal = showUntilTheEnd()) {
+            ::raise(*signal);
+            return exitFailure;
+        }
+        if (!isOver_)
+            printLines(topLines(sortedLook(), {}, style()));
+        return source_.exitStatus();
     }
 
 private:
@@ -199,7 +221,7 @@ private:
             if (events.end)
                 return events.end;
             if (isAsking_ && events.isReadable)
-                read();
+                take();
             for (const char key : events.keys)
                 take(key);
             if (std::exchange(isNew_, false) || events.isToDraw || !events.keys.empty() || isAsking_)
@@ -212,23 +234,35 @@ private:
     {
         if (isAsking_ || !isAwake(screen) || Clock::now() < next_)
             return;
-        descriptor_ = source_.request();
         isAsking_ = true;
         asked_ = Clock::now();
-        if (descriptor_ < 0)
-            read();
+        request();
     }
 
-    void read()
+    void request()
     {
-        source_.read();
+        descriptor_ = source_.request();
+        if (descriptor_ < 0)
+            finish();
+    }
+
+    void take()
+    {
+        if (source_.take())
+            finish();
+        else
+            request();
+    }
+
+    void finish()
+    {
         isAsking_ = false;
         isNew_ = true;
         ++looks_;
         next_ = Clock::now() + std::chrono::duration_cast<Clock::duration>(Seconds(delay_));
     }
 
-    [[nodiscard]] bool isAwake(const Screen& screen) const { return !isPaused_ && screen.isShown(); }
+    [[nodiscard]] bool isAwake(const Screen& screen) const { return !isPaused_ && !isHelp_ && screen.isShown(); }
 
     // Rounded up, so that the screen does not wake too early again and again.
     [[nodiscard]] std::optional<std::chrono::milliseconds> limit(const Screen& screen) const
@@ -259,21 +293,27 @@ private:
 
     void setDelay(double delay)
     {
-        const double before = std::exchange(delay_, std::clamp(delay, shortestDelay, longestDelay));
+        const double before = std::exchange(delay_, std::clamp(delay, shortestWait, longestWait));
         next_ += std::chrono::duration_cast<Clock::duration>(Seconds(delay_ - before));
     }
 
     void draw(Screen& screen) const
     {
-        const TopStyle style{.width = outputWidth(),
-                             .height = outputHeight(),
-                             .hasColor = platform::environment("NO_COLOR").empty(),
-                             .isUTF8 = showsUTF8()};
-        if (isHelp_)
-            return screen.draw(topHelpLines(style));
+        TopStyle fitting = style();
+        fitting.height = outputHeight();
+        screen.draw(isHelp_ ? topHelpLines(fitting) : topLines(sortedLook(), note(), fitting));
+    }
+
+    [[nodiscard]] static TopStyle style()
+    {
+        return {.width = outputWidth(), .hasColor = platform::environment("NO_COLOR").empty(), .isUTF8 = showsUTF8()};
+    }
+
+    [[nodiscard]] TopLook sortedLook() const
+    {
         TopLook look = source_.look().value_or(TopLook{.statusProblem = "the service has not answered yet"});
         sortStreams(look.streams, order_);
-        screen.draw(topLines(look, note(), style));
+        return look;
     }
 
     [[nodiscard]] std::string note() const
@@ -316,8 +356,8 @@ void addTopCommand(CLI::App& application, int& exitStatus)
     command->add_option("--ledger", options->ledgerFile,
                         "The file to read if the service does not run, if it is not at its usual place");
     command->add_option("--database", options->database, "The event store, if it is not at its usual place");
-    command->add_option("--delay", options->delay, "Seconds between two looks; 2 by default")
-        ->check(CLI::Range(shortestDelay, longestDelay));
+    command->add_option("--delay", options->delay, "Seconds between two looks, 0.01 to 86400; 2 by default")
+        ->check(secondsToWait());
     command->add_flag("--batch", options->isBatch, "One look after the other as text, without keys");
     command->add_option("--iterations", options->iterations, "End after this many looks")->check(atLeastOne());
     command->add_flag("--json", options->isJson, "One JSON object for each look, for programs");

@@ -41,11 +41,11 @@ Value partOf(const TopLook& look, std::string_view key)
 
 Value streamsOf(const TopLook& look)
 {
-    if (!look.storeProblem.empty())
+    if (!look.streams)
         return {};
     std::vector<Value> streams;
-    streams.reserve(look.streams.size());
-    for (const PlayingStream& stream : look.streams)
+    streams.reserve(look.streams->size());
+    for (const PlayingStream& stream : *look.streams)
         streams.emplace_back(streamEntries(stream));
     return foundation::Array(std::move(streams));
 }
@@ -57,6 +57,14 @@ bool TopLook::isRunning() const
     return status && status->find("running")->asBoolean();
 }
 
+bool TopLook::isStoring() const
+{
+    if (!isRunning())
+        return false;
+    const Value* const storing = status->find("storing");
+    return storing == nullptr || storing->asBoolean(); // an earlier version does not tell it
+}
+
 std::optional<TopRates> ratesOf(const TopLook& look, const TopLook* before)
 {
     if (!look.isRunning())
@@ -64,18 +72,20 @@ std::optional<TopRates> ratesOf(const TopLook& look, const TopLook* before)
     const auto number = [](const TopLook& of, std::string_view path) {
         return static_cast<double>(numberIn(*of.status, path));
     };
-    if (before == nullptr || !before->isRunning() || before->time >= look.time
+    if (before == nullptr || !before->isRunning() || before->steadyTime >= look.steadyTime
         || number(*before, "started") != number(look, "started"))
         return TopRates{.messages = number(look, "rates.deliveries") / minute,
                         .events = number(look, "rates.events") / minute};
     const auto rate = [&](std::string_view path) {
-        return std::max(0.0, number(look, path) - number(*before, path)) / (look.time - before->time);
+        return std::max(0.0, number(look, path) - number(*before, path)) / (look.steadyTime - before->steadyTime);
     };
     return TopRates{.messages = rate("sinceStart.deliveries"), .events = rate("sinceStart.events")};
 }
 
-void sortStreams(std::vector<PlayingStream>& streams, TopOrder order)
+void sortStreams(std::optional<std::vector<PlayingStream>>& streams, TopOrder order)
 {
+    if (!streams)
+        return;
     const auto byName = [](const PlayingStream& stream) { return std::tie(stream.application, stream.session); };
     const auto precedes = [order](const PlayingStream& left, const PlayingStream& right) {
         switch (order) {
@@ -87,8 +97,8 @@ void sortStreams(std::vector<PlayingStream>& streams, TopOrder order)
         }
         return false;
     };
-    std::ranges::sort(streams, {}, byName);
-    std::ranges::stable_sort(streams, precedes);
+    std::ranges::sort(*streams, {}, byName);
+    std::ranges::stable_sort(*streams, precedes);
 }
 
 std::string topJson(const TopLook& look)

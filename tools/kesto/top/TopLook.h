@@ -20,13 +20,16 @@ struct TopRates { // of each second
 
 struct TopLook {
     double time = 0; // seconds since 1970 UTC
+    double steadyTime = 0; // the same moment by a clock that nobody sets
     std::optional<foundation::Dictionary> status = {}; // of `ledger::report`; none: `statusProblem` says why
     std::string statusProblem = {};
     std::optional<TopRates> rates = {}; // none: the service does not run
-    std::vector<PlayingStream> streams = {}; // empty also if nobody knows what plays: `storeProblem` says why
-    std::string storeProblem = {};
+    std::optional<std::vector<PlayingStream>> streams = {}; // none: nobody knows what plays
+    std::string storeProblem = {}; // why, if the store could not be read
 
     [[nodiscard]] bool isRunning() const;
+    // Whether the store tells what plays: what a killed service left in it plays no more.
+    [[nodiscard]] bool isStoring() const;
 };
 
 // Between two looks at one run of the service, else those of its last minute; none if it does not run.
@@ -36,7 +39,7 @@ enum class TopOrder : std::uint8_t { Since, Application, Device, Volume, Faults 
 
 // Those that play the longest, the loudest and those with the most faults first; names by the alphabet. Equal ones by
 // application and session.
-void sortStreams(std::vector<PlayingStream>& streams, TopOrder order);
+void sortStreams(std::optional<std::vector<PlayingStream>>& streams, TopOrder order);
 
 // One JSON object without a line end.
 [[nodiscard]] std::string topJson(const TopLook& look);

@@ -3,6 +3,7 @@
 
 #include "foundation/text/LocalTime.h"
 #include "kesto/Terminal.h"
+#include "kesto/status/StatusText.h"
 #include "ledger/Report.h"
 
 #include <algorithm>
@@ -52,11 +53,6 @@ private:
     std::vector<std::string> lines_;
 };
 
-std::string momentText(double seconds)
-{
-    return foundation::localTimeText(seconds, "{:%Y-%m-%d %H:%M:%S}");
-}
-
 // The time of day, or the day of an earlier one.
 std::string sinceText(double since, double now)
 {
@@ -89,8 +85,8 @@ void addService(const TopLook& look, Lines& lines)
     else
         lines.add(fmt::format("lost      {} since the start; kesto status says why", groupedText(losses)),
                   Paint::Warning);
-    if (const auto* const storing = status.find("storing"); storing != nullptr && !storing->asBoolean())
-        lines.add("no event is stored: analytics.toml says enabled = false", Paint::Warning);
+    if (!look.isStoring())
+        lines.add(nothingIsStored, Paint::Warning);
 }
 
 void addRow(std::string_view application, std::string_view since, std::string_view volume, std::string_view faults,
@@ -106,10 +102,10 @@ void addRow(std::string_view application, std::string_view since, std::string_vi
               paint);
 }
 
-void addStreams(const TopLook& look, bool isRecording, Lines& lines)
+void addStreams(const std::vector<PlayingStream>& all, double now, bool isRecording, Lines& lines)
 {
     std::vector<const PlayingStream*> streams;
-    for (const PlayingStream& stream : look.streams)
+    for (const PlayingStream& stream : all)
         if (stream.isRecording == isRecording)
             streams.push_back(&stream);
     if (streams.empty())
@@ -119,7 +115,7 @@ void addStreams(const TopLook& look, bool isRecording, Lines& lines)
     const auto known = [](const std::string& text) { return text.empty() ? "-" : text; };
     constexpr double percent = 100;
     for (const PlayingStream* stream : streams)
-        addRow(known(stream->application), sinceText(stream->since, look.time),
+        addRow(known(stream->application), sinceText(stream->since, now),
                stream->volume ? fmt::format("{:.0f} %", *stream->volume * percent) : "-", groupedText(stream->faults),
                known(stream->format), known(stream->device), stream->faults == 0 ? Paint::None : Paint::Warning, lines);
 }
@@ -134,12 +130,14 @@ std::vector<std::string> topLines(const TopLook& look, std::string_view note, co
     if (!look.storeProblem.empty()) {
         lines.add("");
         lines.add(printable(look.storeProblem), Paint::Warning);
-    } else if (look.isRunning() && look.streams.empty()) {
+    }
+    if (look.streams && look.streams->empty()) {
         lines.add("");
         lines.add("nothing plays or records");
+    } else if (look.streams) {
+        addStreams(*look.streams, look.time, false, lines);
+        addStreams(*look.streams, look.time, true, lines);
     }
-    addStreams(look, false, lines);
-    addStreams(look, true, lines);
     return lines.take();
 }
 

@@ -3,6 +3,7 @@
 #include "end_to_end/Kestod.h"
 #include "end_to_end/Sums.h"
 #include "end_to_end/WireClient.h"
+#include "sdk/FakeService.h"
 #include "support/AnotherProcess.h"
 #include "tools/kesto/Tool.h"
 
@@ -322,6 +323,28 @@ TEST_F(StatusCommand, PassesPromtool)
     const Finished checked = tool.runShell("$kesto status --prometheus | promtool check metrics");
     EXPECT_EQ(checked.status, 0);
     EXPECT_EQ(checked.output + checked.errors, "");
+}
+
+TEST_F(StatusCommand, OfAServiceThatSendsSomethingElseIsAnError)
+{
+    const Dictionary whole{{"running", true},
+                           {"version", "9.8.7"},
+                           {"internalBuild", false},
+                           {"now", Dictionary()},
+                           {"sinceStart", Dictionary()}};
+    for (const std::string_view missing : {"", "running", "version", "internalBuild", "now", "sinceStart"}) {
+        Dictionary::Entries entries;
+        for (const auto& [key, value] : whole)
+            if (key.view() != missing)
+                entries.push_back({key, value});
+        const sdk_test::FakeService service(kestod.socketPath(), [&](sdk_test::Peer& peer, const Array& call) {
+            peer.answer(sdk_test::callNumber(call), {Dictionary(entries)});
+        });
+        const Finished finished = tool.run({"status"});
+        EXPECT_EQ(finished.status, missing.empty() ? 0 : 3) << missing;
+        EXPECT_EQ(finished.errors.contains("does not answer: it sent something else than a status"), !missing.empty())
+            << finished.errors;
+    }
 }
 
 TEST_F(StatusCommand, OfAPathThatNoSocketCanHaveIsAnError)

@@ -2,6 +2,9 @@
 // every way out.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
+#include "platform/linux/connection/FrameReader.h"
+#include "platform/linux/files/FileDescriptor.h"
+#include "sdk/FakeService.h"
 #include "support/MessageKinds.h"
 #include "tools/kesto/Tool.h"
 
@@ -15,9 +18,12 @@
 #include <gtest/gtest.h>
 #include <rapidjson/document.h>
 #include <string>
+#include <sys/socket.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 #include <utility>
+#include <vector>
 
 namespace kesto_tool {
 namespace {
@@ -26,6 +32,8 @@ namespace fs = std::filesystem;
 using end_to_end::WireClient;
 using foundation::Array;
 using foundation::Dictionary;
+using sdk_test::FakeService;
+using sdk_test::Peer;
 using support::playback;
 using support::typeStart;
 using testing::HasSubstr;
@@ -40,6 +48,27 @@ constexpr int typeState = 18;
 constexpr std::string_view shownScreen = "\x1B[?1049h"; // the alternate screen
 constexpr std::string_view hiddenScreen = "\x1B[?25h\x1B[?1049l"; // the cursor, and the screen of before
 
+Dictionary statusOf(std::string_view version)
+{
+    return {{"running", true},     {"version", version},         {"internalBuild", false},
+            {"now", Dictionary()}, {"sinceStart", Dictionary()}, {"storing", false}};
+}
+
+FakeService::Handler answerWith(std::string_view version)
+{
+    return [version](Peer& peer, const Array& call) { peer.answer(sdk_test::callNumber(call), {statusOf(version)}); };
+}
+
+// The answer as it goes over the wire.
+std::string framed(std::string_view version)
+{
+    std::string item;
+    foundation::appendCbor(Array{1, foundation::Value(), statusOf(version)}, item);
+    std::string frame;
+    platform::appendFrame(item, frame);
+    return frame;
+}
+
 class TopCommand : public testing::Test {
 protected:
     TopCommand()
@@ -50,6 +79,12 @@ protected:
         tool.setVariable("NO_COLOR");
     }
 
+    // The service makes its store with the first event, the end of the connection that sees that it listens.
+    void startWithAStore()
+    {
+        kestod.startAndAwait();
+        EXPECT_FALSE(kestod.waitForEvents("*uptime").empty());
+    }
     // A session of that application, which plays until the client goes.
     static void play(WireClient& client, const char* application, double since, int session = 1)
     {
@@ -92,6 +127,30 @@ protected:
         EXPECT_FALSE(screen->hasUsualModes());
         return screen;
     }
+    // While it shows that text, nobody is asked.
+    void expectNoQuestions(TerminalProcess& screen, std::string_view shown) const
+    {
+        EXPECT_TRUE(screen.waitFor(shown));
+        const std::uint64_t before = statusCalls();
+        std::uint64_t calls = before;
+        for (unsigned short columns = 60; columns < 70; ++columns) {
+            screen.resize(columns, 24);
+            EXPECT_TRUE(screen.waitFor(shown));
+            calls = statusCalls();
+        }
+        EXPECT_LE(calls - before, 11U) << "the tool itself, and what was asked before";
+    }
+    // Returns when it asks no more, because nobody reads what it draws.
+    void waitUntilTheTerminalIsFull() const
+    {
+        std::uint64_t calls = statusCalls();
+        int unchanged = 0;
+        EXPECT_TRUE(end_to_end::waitUntil([&] {
+            const std::uint64_t before = std::exchange(calls, statusCalls());
+            unchanged = calls == before + 1 ? unchanged + 1 : 0; // its own
+            return unchanged == 3;
+        }));
+    }
     static void expectRestored(const TerminalProcess& screen)
     {
         EXPECT_TRUE(screen.output().ends_with(hiddenScreen)) << screen.output();
@@ -106,7 +165,7 @@ protected:
 
 TEST_F(TopCommand, WithoutATerminalIsOneLookWithoutEscapes)
 {
-    kestod.startAndAwait();
+    startWithAStore();
     EXPECT_THAT(tool.print({"top"}),
                 MatchesRegex("[-0-9]+ [0-9:]+\n"
                              "kestod [0-9.]+, running since [-0-9]+ [0-9:]+\n"
@@ -121,7 +180,7 @@ TEST_F(TopCommand, WithoutATerminalIsOneLookWithoutEscapes)
 
 TEST_F(TopCommand, InABatchPrintsOneLookAfterTheOtherOverOneConnection)
 {
-    kestod.startAndAwait();
+    startWithAStore();
     const std::string looks = tool.print({"top", "--iterations", "3", "--delay", "0.01"});
     EXPECT_THAT(looks, MatchesRegex("2.*\n\n2.*\n\n2.*records\n"));
     EXPECT_THAT(looks, Not(HasSubstr("\x1B")));
@@ -135,26 +194,26 @@ TEST_F(TopCommand, KnowsWhatPlaysSinceWhenAndWithHowManyFaults)
 {
     kestod.startAndAwait();
     WireClient client(kestod.socketPath());
-    play(client, "org.example.player", 1'795'264'500.5);
-    send(client, volume, typeState, {{"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 1'795'264'505.5}});
+    play(client, "org.example.player", 1'577'934'200.5);
+    send(client, volume, typeState, {{"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 1'577'934'205.5}});
     send(client, error, typeIssueDetector, {{"late_cycles", 3}});
     send(client, error, typeIssueDetector, {{"late_cycles", 4}});
-    play(client, "org.example.other", 1'795'264'507, 2);
-    send(client, playback, typeStop, {{"session_output_running", false}, {"kestoreporting_timestamp", 1'795'264'508}},
+    play(client, "org.example.other", 1'577'934'207, 2);
+    send(client, playback, typeStop, {{"session_output_running", false}, {"kestoreporting_timestamp", 1'577'934'208}},
          2);
     const auto look = json();
     ASSERT_EQ(look["streams"].Size(), 1U);
     const auto& stream = look["streams"][0];
     EXPECT_STREQ(stream["application"].GetString(), "org.example.player");
     EXPECT_FALSE(stream["recording"].GetBool());
-    EXPECT_EQ(stream["since"].GetDouble(), 1'795'264'500.5) << "the volume's change is no pause";
+    EXPECT_EQ(stream["since"].GetDouble(), 1'577'934'200.5) << "the volume's change is no pause";
     EXPECT_STREQ(stream["device"].GetString(), "speaker");
     EXPECT_STREQ(stream["format"].GetString(), "S16LE/44100/2");
     EXPECT_EQ(stream["volume"].GetDouble(), 0.5);
     EXPECT_EQ(stream["faults"].GetUint64(), 2U);
     EXPECT_THAT(tool.print({"top"}),
                 HasSubstr("\nPLAYS                  SINCE      VOLUME  FAULTS  FORMAT         DEVICE\n"
-                          "org.example.player     2026-11-21   50 %       2  S16LE/44100/2  speaker\n"));
+                          "org.example.player     2020-01-02   50 %       2  S16LE/44100/2  speaker\n"));
 }
 
 TEST_F(TopCommand, SeesWhatChangesBetweenTwoLooks)
@@ -235,9 +294,31 @@ TEST_F(TopCommand, WhoMayNotReadTheStoreSeesTheRest)
     EXPECT_TRUE(json()["streams"].IsNull());
 }
 
+TEST_F(TopCommand, OfAServiceThatStoresNothingDoesNotSayThatNothingPlays)
+{
+    support::writeFile(kestod.directory() / "configuration" / "analytics.toml", "enabled = false\n");
+    kestod.startAndAwait();
+    EXPECT_TRUE(json()["streams"].IsNull());
+    EXPECT_THAT(tool.print({"top"}), testing::EndsWith("\nno event is stored: analytics.toml says enabled = false\n"));
+}
+
+TEST_F(TopCommand, DoesNotKnowWhatPlaysWithoutTheService)
+{
+    EXPECT_THAT(tool.run({"top", "--json"}).output, HasSubstr("\"streams\":null"));
+}
+
+TEST_F(TopCommand, DoesNotWriteItsLooksIntoTheServicesSocket)
+{
+    FakeService service(kestod.socketPath(), answerWith("9.8.7"));
+    const Finished finished = tool.runShell("$kesto top --iterations 2 --delay 0.01 >&-");
+    EXPECT_EQ(finished.status, 1);
+    EXPECT_THAT(finished.errors, HasSubstr("could not be written"));
+    EXPECT_EQ(service.waitForCalls(1).size(), 1U);
+}
+
 TEST_F(TopCommand, OfADumbTerminalIsOneLookWithoutEscapes)
 {
-    kestod.startAndAwait();
+    startWithAStore();
     tool.setVariable("TERM=dumb");
     const auto terminal = tool.startOnTerminal({"top"});
     EXPECT_EQ(terminal->wait(), 0);
@@ -258,10 +339,15 @@ TEST_F(TopCommand, EndsWithAKeyAndRestoresTheTerminal)
 
 TEST_F(TopCommand, EndsAfterSoManyLooks)
 {
-    kestod.startAndAwait();
+    startWithAStore();
     const auto screen = tool.startOnTerminal({"top", "--iterations", "2", "--delay", "0.01"});
     EXPECT_EQ(screen->wait(), 0);
-    expectRestored(*screen);
+    const std::size_t end = screen->output().rfind(hiddenScreen);
+    ASSERT_NE(end, std::string::npos);
+    EXPECT_THAT(screen->output().substr(end + hiddenScreen.size()),
+                testing::AllOf(HasSubstr("\r\nkestod "), testing::EndsWith("\r\nnothing plays or records\r\n")))
+        << "the last look stays";
+    EXPECT_TRUE(screen->hasUsualModes());
     EXPECT_EQ(statusCalls(), 3U);
 }
 
@@ -294,22 +380,25 @@ TEST_F(TopCommand, AsksNobodyInAPause)
     kestod.startAndAwait();
     const auto screen = startScreen({"--delay", "0.01"});
     screen->type(" ");
-    EXPECT_TRUE(screen->waitFor("paused"));
-    const std::uint64_t before = statusCalls();
-    std::uint64_t calls = before;
-    for (unsigned short columns = 60; columns < 70; ++columns) {
-        screen->resize(columns, 24);
-        EXPECT_TRUE(screen->waitFor("paused"));
-        calls = statusCalls();
-    }
-    EXPECT_LE(calls - before, 11U) << "the tool itself, and what was asked before the pause";
+    expectNoQuestions(*screen, "paused");
     screen->type(" ");
     EXPECT_TRUE(screen->waitFor("every 0.01 s"));
+    std::uint64_t calls = statusCalls();
     EXPECT_TRUE(end_to_end::waitUntil([&] {
         EXPECT_TRUE(screen->waitFor("kestod")); // somebody must read
         const std::uint64_t last = std::exchange(calls, statusCalls());
         return calls > last + 1;
     }));
+}
+
+TEST_F(TopCommand, AsksNobodyUnderTheListOfKeys)
+{
+    kestod.startAndAwait();
+    const auto screen = startScreen({"--delay", "0.01"});
+    screen->type("h");
+    expectNoQuestions(*screen, "Space  pauses");
+    screen->type("h");
+    EXPECT_TRUE(screen->waitFor("every 0.01 s"));
 }
 
 TEST_F(TopCommand, IsDrawnAgainForAnotherSize)
@@ -323,7 +412,9 @@ TEST_F(TopCommand, IsDrawnAgainForAnotherSize)
 
 class TopSignal : public TopCommand, public testing::WithParamInterface<int> { };
 
-INSTANTIATE_TEST_SUITE_P(OfEveryKind, TopSignal, testing::Values(SIGINT, SIGTERM, SIGHUP, SIGQUIT),
+INSTANTIATE_TEST_SUITE_P(OfEveryKind, TopSignal,
+                         testing::Values(SIGINT, SIGTERM, SIGHUP, SIGQUIT, SIGUSR1, SIGUSR2, SIGALRM, SIGVTALRM,
+                                         SIGPROF, SIGXCPU, SIGPWR, SIGIO),
                          [](const auto& input) { return std::string("SIG") + ::sigabbrev_np(input.param); });
 
 TEST_P(TopSignal, RestoresTheTerminalAndEndsTheProgram)
@@ -356,11 +447,7 @@ TEST_F(TopCommand, ATerminalThatNobodyReadsDoesNotKeepItFromEnding)
 {
     kestod.startAndAwait();
     const auto screen = startScreen({"--delay", "0.01"});
-    std::uint64_t calls = statusCalls();
-    EXPECT_TRUE(end_to_end::waitUntil([&] {
-        const std::uint64_t before = std::exchange(calls, statusCalls());
-        return calls == before + 1; // it asks no more, because it cannot draw
-    }));
+    waitUntilTheTerminalIsFull();
     screen->signal(SIGTERM);
     siginfo_t ended{};
     EXPECT_TRUE(end_to_end::waitUntil([&] {
@@ -369,6 +456,17 @@ TEST_F(TopCommand, ATerminalThatNobodyReadsDoesNotKeepItFromEnding)
     }));
     EXPECT_EQ(screen->wait(), 128 + SIGTERM);
     EXPECT_TRUE(screen->hasUsualModes());
+}
+
+TEST_F(TopCommand, ASecondSignalDoesNotKeepItFromRestoringTheTerminal)
+{
+    kestod.startAndAwait();
+    const auto screen = startScreen({"--delay", "0.01"});
+    waitUntilTheTerminalIsFull();
+    screen->signal(SIGTERM);
+    screen->signal(SIGINT);
+    EXPECT_THAT(screen->wait(), testing::AnyOf(128 + SIGTERM, 128 + SIGINT));
+    expectRestored(*screen);
 }
 
 TEST_F(TopCommand, WhileItIsStoppedTheTerminalIsTheShells)
@@ -457,6 +555,75 @@ TEST_F(TopCommand, KeysWorkWhileTheServiceDoesNotAnswer)
     screen->type("q");
     EXPECT_EQ(screen->wait(), 0);
     EXPECT_EQ(kestod.waitForEvents("*uptime", 2).size(), 2U) << "it kept its connection";
+}
+
+// --- A service that hangs or misbehaves
+
+TEST_F(TopCommand, KeysWorkWhileAPartOfTheAnswerIsMissing)
+{
+    const std::string whole = framed("9.8.7");
+    FakeService service(kestod.socketPath(),
+                        [&](Peer& peer, const Array&) { peer.sendBytes(std::string_view(whole).substr(0, 9)); });
+    const auto screen = tool.startOnTerminal({"top", "--delay", "4000"});
+    EXPECT_EQ(service.waitForCalls(1).size(), 1U);
+    service.forEachPeer([](Peer&) { }); // the part is sent
+    screen->type("h");
+    EXPECT_TRUE(screen->waitFor("Space  pauses"));
+    service.forEachPeer([&](Peer& peer) { peer.sendBytes(std::string_view(whole).substr(9)); });
+    screen->type("h");
+    EXPECT_TRUE(screen->waitFor("kestod 9.8.7"));
+    EXPECT_EQ(service.connections(), 1U);
+}
+
+TEST_F(TopCommand, KeysWorkWhileTheServiceThatFollowsOneThatEndedDoesNotAnswer)
+{
+    FakeService service(kestod.socketPath(), [calls = 0](Peer& peer, const Array& call) mutable {
+        if (++calls == 1)
+            answerWith("9.8.7")(peer, call);
+        else if (calls == 2)
+            peer.close();
+    });
+    const auto screen = tool.startOnTerminal({"top", "--delay", "0.01"});
+    EXPECT_EQ(service.waitForCalls(3).size(), 3U);
+    screen->type("h");
+    EXPECT_TRUE(screen->waitFor("Space  pauses"));
+    service.forEachPeer([](Peer& peer) { peer.sendBytes(framed("9.8.8")); });
+    screen->type("h");
+    EXPECT_TRUE(screen->waitFor("kestod 9.8.8"));
+    EXPECT_EQ(service.connections(), 2U);
+}
+
+TEST_F(TopCommand, SaysThatTooManyWaitForTheService)
+{
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    kestod.socketPath().native().copy(address.sun_path, sizeof address.sun_path - 1);
+    const auto* const generic = reinterpret_cast<const sockaddr*>(&address);
+    const platform::FileDescriptor busy(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    ASSERT_EQ(::bind(busy.get(), generic, sizeof address), 0);
+    ASSERT_EQ(::listen(busy.get(), 0), 0);
+    std::vector<platform::FileDescriptor> waiting;
+    do
+        waiting.emplace_back(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
+    while (::connect(waiting.back().get(), generic, sizeof address) == 0);
+    const auto screen = tool.startOnTerminal({"top", "--delay", "4000"});
+    screen->resize(200, 24);
+    EXPECT_TRUE(screen->waitFor("does not answer: too many others wait for it"));
+    screen->type("q");
+    EXPECT_EQ(screen->wait(), 3);
+}
+
+TEST_F(TopCommand, OfAServiceThatSendsSomethingElseSaysSoAndRestoresTheTerminal)
+{
+    const FakeService service(kestod.socketPath(), [](Peer& peer, const Array& call) {
+        peer.answer(sdk_test::callNumber(call), {Dictionary()});
+    });
+    const auto screen = tool.startOnTerminal({"top", "--delay", "4000"});
+    screen->resize(200, 24);
+    EXPECT_TRUE(screen->waitFor("it sent something else than a status"));
+    screen->type("q");
+    EXPECT_EQ(screen->wait(), 3);
+    expectRestored(*screen);
 }
 
 TEST_F(TopCommand, HonoursTheWishForNoColours)

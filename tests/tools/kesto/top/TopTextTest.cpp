@@ -50,7 +50,10 @@ protected:
         const ledger::ServiceProcess service{.version = "1.2.3", .started = started, .memory = [] {
                                                  return ledger::MemoryState{.used = 1'200'000, .limit = 268'400'000};
                                              }};
-        TopLook look{.time = time, .status = ledger::report(*ledger, service, false), .streams = std::move(streams)};
+        TopLook look{.time = time,
+                     .steadyTime = time,
+                     .status = ledger::report(*ledger, service, false),
+                     .streams = std::move(streams)};
         look.rates = ratesOf(look, nullptr);
         return look;
     }
@@ -64,7 +67,7 @@ TEST_F(TopText, HasTheServiceAndWhatPlays)
 {
     TopLook both =
         look({stream(1, "org.example.player", 1'700'000'002, 0.5, 0), stream(2, "radio", 1'699'900'000, 1, 1'204)});
-    both.streams.push_back({.session = 3, .isRecording = true, .since = 1'700'000'100});
+    both.streams->push_back({.session = 3, .isRecording = true, .since = 1'700'000'100});
     EXPECT_THAT(topLines(both, "every 2 s", {}),
                 ElementsAre("2023-11-14 22:15:30, every 2 s", "kestod 1.2.3, running since 2023-11-14 22:13:20",
                             "clients   3 connections, with 1 session", "traffic   1.5 messages and 3.0 events a second",
@@ -85,10 +88,18 @@ TEST_F(TopText, SaysThatNothingPlays)
 TEST_F(TopText, SaysWhyItDoesNotKnowWhatPlays)
 {
     TopLook blind = look();
+    blind.streams.reset();
     blind.storeProblem = "cannot read the event store /x\n: permission denied";
     const auto lines = topLines(blind, {}, {});
     EXPECT_EQ(lines.at(2), "clients   3 connections, with 1 session");
     EXPECT_EQ(lines.back(), "cannot read the event store /x?: permission denied");
+}
+
+TEST_F(TopText, DoesNotSayThatNothingPlaysIfNobodyKnows)
+{
+    TopLook blind = look();
+    blind.streams.reset();
+    EXPECT_EQ(topLines(blind, {}, {}).back(), "lost      nothing");
 }
 
 TEST_F(TopText, SaysThatTheServiceDoesNotRunOrAnswer)
@@ -162,6 +173,15 @@ TEST_F(TopLookTest, RatesAreThoseBetweenTwoLooks)
     EXPECT_DOUBLE_EQ(ratesOf(after, &before)->events, 0.25);
 }
 
+TEST_F(TopLookTest, RatesDoNotFollowAClockThatIsSet)
+{
+    const TopLook before = look();
+    count(Counter::Deliveries, 10);
+    TopLook after = look({}, now + 4);
+    after.time = now - 3'600;
+    EXPECT_DOUBLE_EQ(ratesOf(after, &before)->messages, 2.5);
+}
+
 TEST_F(TopLookTest, RatesOfAnotherRunAreThoseOfTheLastMinute)
 {
     const TopLook before = look({}, now, 1'600'000'000);
@@ -179,11 +199,11 @@ TEST_F(TopLookTest, SortsStreams)
     const std::vector<PlayingStream> unsorted{stream(4, "c", 3, 0.5, 0), stream(3, "a", 2, std::nullopt, 1),
                                               stream(2, "b", 1, 1, 2), stream(1, "a", 4, 0.5, 1)};
     const auto sorted = [&unsorted](TopOrder order) {
-        auto streams = unsorted;
-        streams.at(0).device = "headset";
+        std::optional streams = unsorted;
+        streams->at(0).device = "headset";
         sortStreams(streams, order);
         std::vector<std::int64_t> sessions;
-        for (const PlayingStream& each : streams)
+        for (const PlayingStream& each : *streams)
             sessions.push_back(each.session);
         return sessions;
     };
@@ -203,12 +223,16 @@ TEST_F(TopLookTest, IsOneJsonObject)
               R"("store":{"events":1204,"bytes":35200000,"oldest":1650000000},"losses":0,)"
               R"("streams":[{"session":1,"application":"a\"\n","recording":false,"since":1700000002.5,)"
               R"("device":"speaker","format":"S16LE/44100/2","volume":0.5,"faults":2}],"storeProblem":null})");
-    const TopLook silent{.time = 1.5, .statusProblem = "no", .storeProblem = "not either"};
+    const TopLook silent{.time = 1.5, .statusProblem = "no"};
     EXPECT_EQ(topJson(silent),
               R"({"time":1.5,"running":false,"statusProblem":"no","version":null,"started":null,)"
               R"("connections":null,"sessions":null,"messagesPerSecond":null,"eventsPerSecond":null,)"
               R"("memory":null,"storing":null,"store":null,"losses":null,"streams":null,)"
-              R"("storeProblem":"not either"})");
+              R"("storeProblem":null})");
+    TopLook blind = look();
+    blind.streams.reset();
+    blind.storeProblem = "not readable";
+    EXPECT_TRUE(topJson(blind).ends_with(R"("streams":null,"storeProblem":"not readable"})"));
 }
 
 } // namespace
