@@ -50,7 +50,7 @@ TEST_F(OutputFile, IsMadeAsTheUmaskAllows)
 TEST_F(OutputFile, ReplacesAFileWithItsPermissions)
 {
     support::writeFile(file_, "old");
-    fs::permissions(file_, fs::perms(0600));
+    fs::permissions(file_, fs::perms::owner_read | fs::perms::owner_write);
     fs::create_hard_link(file_, directory_ / "old");
     writeWholeOutput(file_, "new");
     EXPECT_EQ(support::readFile(file_), "new");
