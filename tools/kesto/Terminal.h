@@ -26,7 +26,7 @@
 // share above 0 is always seen. At least one column.
 [[nodiscard]] std::string bar(double share, std::size_t columns, bool isUTF8);
 
-// A time of day for a person, in local time: "2026-01-31 18:00:00".
+// A moment for a person, in local time: "2026-01-31 18:00:00".
 [[nodiscard]] std::string momentText(double secondsSince1970);
 
 // How many columns standard output has: those of the terminal, else $COLUMNS, else unlimited (npos).

@@ -65,6 +65,30 @@ INSTANTIATE_TEST_SUITE_P(
         WrongArguments{"StatusAsTwoFormats", {"status", "--json", "--prometheus"}, "--prometheus"},
         WrongArguments{"WatchedMetrics", {"status", "--watch", "--prometheus"}, "--prometheus"},
         WrongArguments{"AnIntervalWithoutWatching", {"status", "--interval", "1"}, "--watch"},
+        WrongArguments{"ADelayThatIsNoNumber", {"top", "--delay", "nan"}, "\"nan\" is not a number from 0.01 to 86400"},
+        WrongArguments{
+            "ADelayThatIsTooLong", {"top", "--delay", "86401"}, "\"86401\" is not a number from 0.01 to 86400"},
+        WrongArguments{"AnIntervalOfStatusThatIsNoNumber",
+                       {"status", "--watch", "--interval", "nan"},
+                       "\"nan\" is not a number from 0.01 to 86400"},
+        WrongArguments{"AnIntervalOfChannelsThatIsNoNumber",
+                       {"channels", "--watch", "--interval", "nan"},
+                       "\"nan\" is not a number from 0.01 to 86400"},
+        WrongArguments{"AnIntervalThatIsTooShort",
+                       {"channels", "--watch", "--interval", "0"},
+                       "\"0\" is not a number from 0.01 to 86400"},
+        WrongArguments{"AnIntervalWithAUnit",
+                       {"status", "--watch", "--interval", "2s"},
+                       "\"2s\" is not a number from 0.01 to 86400"},
+        WrongArguments{"OneSessionSince", {"sessions", "1", "--since", "soon"}, "excludes"},
+        WrongArguments{"OneSessionThatRuns", {"sessions", "1", "--running"}, "excludes"},
+        WrongArguments{"OneSessionWithFaults", {"sessions", "1", "--faults"}, "excludes"},
+        WrongArguments{"OneSessionSorted", {"sessions", "1", "--sort", "played"}, "excludes"},
+        WrongArguments{"OneSessionCounted", {"sessions", "1", "--count", "1"}, "excludes"},
+        WrongArguments{"ASessionWithoutANumber", {"sessions", "first"}, "\"first\" is not a number from 1 on"},
+        WrongArguments{"ASessionThatNoStoreHas",
+                       {"sessions", "99999999999999999999"},
+                       "\"99999999999999999999\" is not a number from 1 on"},
         WrongArguments{"ANegativeWait", {"client", "--wait", "-1"}, "--wait"},
         WrongArguments{"PrefsWithoutAVerb", {"prefs"}, "subcommand is required"},
         WrongArguments{"PrefsWithAnUnknownVerb", {"prefs", "toggle", "a", "b"}, "toggle"},
@@ -93,6 +117,16 @@ TEST_F(CommandLine, OutputThatCannotBeWrittenIsAFailure)
         tool.runShell("cd " + directory.path().native() + " && $kesto summary summary.json >/dev/full");
     EXPECT_EQ(finished.status, 1);
     EXPECT_THAT(finished.errors, HasSubstr("could not be written"));
+}
+
+TEST_F(CommandLine, OutputThatIsClosedIsAFailure)
+{
+    support::writeFile(directory.path() / "summary.json", R"([{"A_B_1": {"a": 1}}])");
+    const std::string command = "cd " + directory.path().native() + " && $kesto summary summary.json <&- >&-";
+    const Finished finished = tool.runShell(command);
+    EXPECT_EQ(finished.status, 1);
+    EXPECT_THAT(finished.errors, HasSubstr("could not be written"));
+    EXPECT_EQ(tool.runShell(command + " 2>&-").status, 1);
 }
 
 } // namespace

@@ -28,14 +28,10 @@ std::string devicesOf(StretchesOfOne stretches)
     return text;
 }
 
-SessionEnd endOf(StretchesOfOne stretches)
+// If the clock was set back meanwhile, the one that runs is not the last.
+SessionEnd endOfAll(StretchesOfOne stretches)
 {
-    const PlayedStretch& last = stretches.back();
-    if (last.isRunning)
-        return SessionEnd::Running;
-    if (last.hasVanished)
-        return SessionEnd::Vanished;
-    return last.hasServiceEnded ? SessionEnd::ServiceEnded : SessionEnd::Stopped;
+    return std::ranges::any_of(stretches, &PlayedStretch::isRunning) ? SessionEnd::Running : endOf(stretches.back());
 }
 
 } // namespace
@@ -63,6 +59,15 @@ std::string_view name(SessionEnd end)
     return "";
 }
 
+SessionEnd endOf(const PlayedStretch& stretch)
+{
+    if (stretch.isRunning)
+        return SessionEnd::Running;
+    if (stretch.hasVanished)
+        return SessionEnd::Vanished;
+    return stretch.hasServiceEnded ? SessionEnd::ServiceEnded : SessionEnd::Stopped;
+}
+
 std::vector<SessionLine> makeSessionLines(const History& history)
 {
     std::vector<SessionLine> lines;
@@ -81,7 +86,7 @@ std::vector<SessionLine> makeSessionLines(const History& history)
             for (const PlayedStretch& stretch : stretches)
                 addTo(line.played, stretch);
             line.devices = devicesOf(stretches);
-            line.end = endOf(stretches);
+            line.end = endOfAll(stretches);
         }
         first = last;
     }

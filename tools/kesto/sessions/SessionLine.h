@@ -14,6 +14,8 @@ enum class SessionEnd : std::uint8_t { Unknown, Running, Stopped, Vanished, Serv
 
 // "running", "stopped", "vanished" or "service ended"; empty: not known.
 [[nodiscard]] std::string_view name(SessionEnd end);
+// Of one stretch; a change that the next one goes on from looks like a stop.
+[[nodiscard]] SessionEnd endOf(const PlayedStretch& stretch);
 
 struct SessionLine {
     HistorySession session;

@@ -78,13 +78,16 @@ std::string lineOf(Dictionary::Entries entries)
     return text + '\n';
 }
 
-std::string_view endOf(const PlayedStretch& stretch)
+// Empty for a change as for a stop.
+std::string_view endText(const PlayedStretch& stretch)
 {
-    if (stretch.isRunning)
-        return name(SessionEnd::Running);
-    if (stretch.hasVanished)
-        return name(SessionEnd::Vanished);
-    return stretch.hasServiceEnded ? name(SessionEnd::ServiceEnded) : "";
+    const SessionEnd end = endOf(stretch);
+    return end == SessionEnd::Stopped ? "" : name(end);
+}
+
+std::string_view endText(const SessionLine& line)
+{
+    return line.end == SessionEnd::Unknown ? "-" : name(line.end);
 }
 
 } // namespace
@@ -108,9 +111,12 @@ std::string volumeText(const Played& played)
 
 std::string sessionsText(const std::vector<SessionLine>& lines, std::size_t width)
 {
-    constexpr std::size_t fixed = 58; // with the blanks, and with room for the shorter ends
+    constexpr std::size_t fixed = 51; // with the blanks, without names and ends
     constexpr std::size_t mostForNames = 50;
-    const std::size_t forNames = std::min(columnsBehind(fixed, width), mostForNames);
+    std::size_t longestEnd = std::string_view("END").size();
+    for (const SessionLine& line : lines)
+        longestEnd = std::max(longestEnd, endText(line).size());
+    const std::size_t forNames = std::min(columnsBehind(fixed + longestEnd, width), mostForNames);
     const auto name = [columns = forNames / 2](std::string_view text) {
         return padded(fitted(text.empty() ? "-" : printable(text), columns), columns);
     };
@@ -123,10 +129,10 @@ std::string sessionsText(const std::vector<SessionLine>& lines, std::size_t widt
                         width)) += '\n';
     };
     add("SESSION", "BEGAN", "APPLICATION", "PLAYED", "VOLUME", "FAULTS", "DEVICE", "END");
-    for (const auto& [session, played, devices, end] : lines)
-        add(std::to_string(session.id), foundation::localTimeText(session.began, "{:%Y-%m-%d %H:%M}"),
-            session.application, clockText(played.seconds), volumeText(played), std::to_string(played.faults), devices,
-            end == SessionEnd::Unknown ? "-" : ::name(end));
+    for (const SessionLine& line : lines)
+        add(std::to_string(line.session.id), foundation::localTimeText(line.session.began, "{:%Y-%m-%d %H:%M}"),
+            line.session.application, clockText(line.played.seconds), volumeText(line.played),
+            std::to_string(line.played.faults), line.devices, endText(line));
     return text;
 }
 
@@ -156,7 +162,7 @@ std::string sessionCsv(const History& history)
     for (const PlayedStretch& stretch : history.stretches)
         text += fmt::format("{},{},{},{},{},{}\n", utcText(stretch.began), decimal(stretch.seconds, secondDecimals),
                             csvField(stretch.device), csvField(stretch.format),
-                            stretch.volume ? decimal(*stretch.volume, volumeDecimals) : "", endOf(stretch));
+                            stretch.volume ? decimal(*stretch.volume, volumeDecimals) : "", endText(stretch));
     return text;
 }
 
@@ -170,7 +176,7 @@ std::string sessionJson(const SessionLine& line, const History& history)
                                           {"device", known(stretch.device)},
                                           {"format", known(stretch.format)},
                                           {"volume", valueOf(stretch.volume)},
-                                          {"end", known(endOf(stretch))}});
+                                          {"end", known(endText(stretch))}});
     std::vector<Value> faults;
     faults.reserve(history.faults.size());
     for (const Fault& fault : history.faults)

@@ -77,8 +77,10 @@ int showOne(std::int64_t session, const SessionsOptions& options)
             history = std::move(recorded);
     const auto lines = makeSessionLines(history);
     if (lines.empty())
-        throw EventStoreError(fmt::format("no session {} in {}: kesto sessions --since 90d lists those that played",
-                                          session, options.database.native()));
+        throw EventStoreError(fmt::format("session {} {}recorded nothing, or is not in {}: kesto sessions --since 90d"
+                                          " lists those that played",
+                                          session, options.isRecording ? "" : "played and ",
+                                          printable(options.database.native())));
     if (options.isJson)
         fmt::print("{}", sessionJson(lines.front(), history));
     else if (options.isCsv)
@@ -94,17 +96,22 @@ void addSessionsCommand(CLI::App& application, int& exitStatus)
 {
     const auto options = std::make_shared<SessionsOptions>();
     CLI::App* command = application.add_subcommand("sessions", "Lists who played when, or shows one session's time");
-    command->add_option("NUMBER", options->number, "Show this session, with its timeline");
+    CLI::Option* number =
+        command->add_option("NUMBER", options->number, "Show this session, with its timeline")->check(atLeastOne());
     command->add_option("--database", options->database, "The event store, if it is not at its usual place");
-    command->add_option("--since", options->since,
-                        "Sessions that played since then: 90s, 10m, 2h, 30d ago, or a time such as 2026-01-31; 7d by "
-                        "default");
-    command->add_flag("--faults", options->choice.withFaults, "Only sessions with faults");
-    command->add_flag("--running", options->choice.isRunning, "Only sessions that play now");
+    command
+        ->add_option(
+            "--since", options->since,
+            "Sessions that played or had faults since then: 90s, 10m, 2h, 30d ago, or a time such as 2026-01-31; 7d by "
+            "default")
+        ->excludes(number);
+    command->add_flag("--faults", options->choice.withFaults, "Only sessions with faults")->excludes(number);
+    command->add_flag("--running", options->choice.isRunning, "Only sessions that play now")->excludes(number);
     command->add_flag("--recording", options->isRecording, "Sessions that recorded, in place of those that played");
     command->add_option("--sort", options->order, "What comes first: the latest, the longest, the most faults")
-        ->check(CLI::IsMember(orders()));
-    command->add_option("--count", options->choice.most, "At most this many")->check(atLeastOne());
+        ->check(CLI::IsMember(orders()))
+        ->excludes(number);
+    command->add_option("--count", options->choice.most, "At most this many")->check(atLeastOne())->excludes(number);
     CLI::Option* csv = command->add_flag("--csv", options->isCsv, "As CSV");
     command->add_flag("--json", options->isJson, "One JSON object in each line, for programs")->excludes(csv);
     command->callback([options, &exitStatus] {

@@ -90,7 +90,7 @@ TEST_F(SessionsCommand, ListsThemWithTheirEnds)
     EXPECT_THAT(column(2, {"--running"}), ElementsAre("application", "running"));
     EXPECT_THAT(column(2, {"--faults"}), ElementsAre("application", "running"));
     EXPECT_THAT(column(6, {"--sort", "faults", "--count", "2"}), ElementsAre("faults", "1", "0"));
-    EXPECT_THAT(column(3, {"--sort", "played"}).at(1), "10.0") << "the one that stopped by its own stamps";
+    EXPECT_THAT(tool.print({"sessions", "--csv"}), HasSubstr(",stopping,10.0,")) << "by its own stamps";
     EXPECT_THAT(tool.print({"sessions"}),
                 MatchesRegex("SESSION BEGAN .*\n"
                              "      3 2.* running .*0:0.* 1 speaker .*running\n"
@@ -146,7 +146,11 @@ TEST_F(SessionsCommand, OfANumberThatIsNoneIsAnError)
     const Finished finished = tool.run({"sessions", "7"});
     EXPECT_EQ(finished.status, 1);
     EXPECT_EQ(finished.output, "");
-    EXPECT_THAT(finished.errors, MatchesRegex("kesto: no session 7 in .*: kesto sessions --since 90d lists .*\n"));
+    EXPECT_THAT(finished.errors,
+                MatchesRegex("kesto: session 7 played and recorded nothing, or is not in .*: kesto sessions --since 90d"
+                             " lists .*\n"));
+    EXPECT_THAT(tool.run({"sessions", "1", "--recording"}).errors,
+                HasSubstr("kesto: session 1 recorded nothing, or is not in "));
 }
 
 TEST_F(SessionsCommand, RefusesWhatMakesNoSense)

@@ -98,6 +98,13 @@ TEST_F(Sessions, EndAsTheirLastStretch)
     EXPECT_EQ(lines()[0].end, SessionEnd::Stopped);
 }
 
+TEST_F(Sessions, RunAlsoIfTheClockWasSetBackMeanwhile)
+{
+    history.stretches[1].isRunning = true;
+    EXPECT_EQ(lines()[0].end, SessionEnd::Running);
+    EXPECT_THAT(numbers({.isRunning = true}), ElementsAre(2, 1));
+}
+
 TEST_F(Sessions, LeaveOutWhatBelongsToNone)
 {
     history.stretches.insert(history.stretches.begin(), stretch(0, 0, 10, 1.0));
@@ -135,6 +142,18 @@ TEST_F(Sessions, AreCutToTheTerminal)
                 HasSubstr("      1 2023-11-14 22:13 org.e…   0:01:10   62 %      2 heads… stopped\n"));
     EXPECT_THAT(sessionsText(lines(), 20), HasSubstr("      1 2023-11-14 …\n"));
     EXPECT_THAT(sessionsText(lines(), std::string::npos), HasSubstr("headset; speaker          stopped\n"));
+}
+
+TEST_F(Sessions, AreCutBeforeTheirEnds)
+{
+    history.sessions[0].application = "org.example.player";
+    history.stretches[3].hasServiceEnded = true;
+    EXPECT_THAT(sessionsText(lines(), 80),
+                HasSubstr("      1 2023-11-14 22:13 org.exa…   0:01:10   62 %      2 headset… service ended\n"));
+    history.stretches[3].hasServiceEnded = false;
+    history.stretches[3].hasVanished = true;
+    EXPECT_THAT(sessionsText(lines(), 80),
+                HasSubstr("      1 2023-11-14 22:13 org.examp…   0:01:10   62 %      2 headset; … vanished\n"));
 }
 
 TEST_F(Sessions, AreCsv)
