@@ -166,14 +166,14 @@ Dictionary StatusSource::read()
     const auto end = Clock::now() + std::chrono::seconds(10);
     while (true) {
         pollfd answer{.fd = request(), .events = POLLIN, .revents = 0};
-        if (answer.fd >= 0) {
-            const auto rest = std::chrono::ceil<std::chrono::milliseconds>(end - Clock::now()).count();
-            if (rest <= 0) {
-                disconnect();
-                throw noAnswer("it takes more than ten seconds");
-            }
-            ::poll(&answer, 1, static_cast<int>(rest));
+        if (answer.fd < 0)
+            return readLedger();
+        const auto rest = std::chrono::ceil<std::chrono::milliseconds>(end - Clock::now()).count();
+        if (rest <= 0) {
+            disconnect();
+            throw noAnswer("it takes more than ten seconds");
         }
+        ::poll(&answer, 1, static_cast<int>(rest));
         if (auto report = take())
             return *report;
     }
