@@ -33,7 +33,7 @@ Seconds firstMomentOf(Seconds wall, bool isUTC)
     const Seconds before = wall - 2 * secondsADay;
     const Seconds after = wall + 2 * secondsADay;
     const auto [early, late] =
-        std::minmax(wall - (wallAt(before, isUTC) - before), wall - (wallAt(after, isUTC) - after));
+        std::minmax({wall - (wallAt(before, isUTC) - before), wall - (wallAt(after, isUTC) - after)});
     for (const Seconds moment : {early, late}) // both of a time that is shown twice
         if (wallAt(moment, isUTC) == wall)
             return moment;

@@ -98,12 +98,9 @@ void FairShares::charge(Duration time, bool wantsMore)
     for (Node* node = &share; node != root_.get(); node = node->group.get())
         node->used += time;
     if (only_ == nullptr)
-        return moveFirst(*share.group, wantsMore);
-    if (wantsMore)
-        return;
-    for (Node* node = &share; node != root_.get(); node = node->group.get())
-        node->group->now = node->used;
-    only_.reset();
+        moveFirst(*share.group, wantsMore);
+    else if (!wantsMore)
+        only_.reset();
 }
 
 // The first of the group goes to its new place, or leaves, and so does the group.
@@ -113,8 +110,6 @@ void FairShares::moveFirst(Node& group, bool wantsMore)
     first.key() = first.mapped()->used;
     if (wantsMore)
         group.contest.insert(std::move(first));
-    else if (group.contest.empty())
-        group.now = first.key();
     if (&group != root_.get())
         moveFirst(*group.group, !group.contest.empty());
 }

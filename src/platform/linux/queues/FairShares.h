@@ -4,7 +4,8 @@
 // among the user's processes the one that took the least, and among the process's shares again: start-time fair
 // queueing (P. Goyal, H. M. Vin, H. Cheng, 1996) at three levels. So a process gains nothing by many connections. Who
 // wanted nothing for a while goes on where the others are now: a pause earns no time to be used at once later, and
-// costs none. A user who starts one process after the other may hold up the user's other processes, and nobody else's.
+// costs none. Only who was served last before a pause of all comes behind the others after it, by what that took. A
+// user who starts one process after the other may hold up the user's other processes, and nobody else's.
 #pragma once
 
 #include "platform/WorkQueue.h"

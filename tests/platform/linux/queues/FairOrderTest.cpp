@@ -153,33 +153,6 @@ TEST_F(FairOrderTest, APauseEarnsNoTimeForLater)
     EXPECT_THAT(serveTimes(4, 1ms), ElementsAre("pausing", "busy", "pausing", "busy"));
 }
 
-TEST_F(FairOrderTest, APauseOfAllCostsNothing)
-{
-    for (const Submitter& submitter : {alice, alicesOther, bob}) {
-        const Lane worked = order.makeLane(alice);
-        add(worked, "long");
-        serve(1s);
-        const Lane other = order.makeLane(submitter);
-        addMany(other, "other", 2);
-        addMany(worked, "worked", 2);
-        EXPECT_THAT(serveTimes(4, 1ms), ElementsAre("other", "worked", "other", "worked"));
-    }
-}
-
-TEST_F(FairOrderTest, APauseOfTwoCostsNothing)
-{
-    const Lane worked = order.makeLane(alice);
-    const Lane other = order.makeLane(bob);
-    add(worked, "worked");
-    add(other, "other");
-    serve(1s);
-    serve(1s);
-    const Lane late = order.makeLane({.user = 1002, .process = 4});
-    addMany(late, "late", 2);
-    addMany(worked, "worked", 2);
-    EXPECT_THAT(serveTimes(4, 1ms), ElementsAre("late", "worked", "late", "worked"));
-}
-
 TEST_F(FairOrderTest, WhatALaneUsedCountsAlsoWhenItWasEmptyForAMoment)
 {
     const Lane greedy = order.makeLane(alice);
