@@ -186,11 +186,7 @@ TEST_F(StretchesEndTest, WhatGoesOnAfterItsConnectionBrokeCountsOnce)
     send(again, playback, typeStart, says(true, 0));
     send(again, playback, typeStop, says(false, 200));
     EXPECT_THAT(kestod.query("SELECT ending FROM stretches ORDER BY id"), ElementsAre("vanished", "stopped"));
-    EXPECT_THAT(kestod.query("SELECT round(max(began + seconds) - min(began), 3) FROM stretches"),
-                ElementsAre("200.0"));
-    EXPECT_THAT(kestod.query("SELECT a.began + a.seconds <= b.began FROM stretches a, stretches b"
-                             " WHERE a.ending = 'vanished' AND b.ending = 'stopped'"),
-                ElementsAre("1"));
+    EXPECT_THAT(kestod.query("SELECT round(sum(seconds), 6) FROM stretches"), ElementsAre("200.0"));
 }
 
 TEST_F(StretchesEndTest, TheServicesEndEndsIt)
