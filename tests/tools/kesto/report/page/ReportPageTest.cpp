@@ -441,7 +441,7 @@ double luminance(const std::string& colour)
 
 double contrast(const Colours& colours, const char* one, const char* other)
 {
-    const auto [low, high] = std::minmax(luminance(colours.at(one)), luminance(colours.at(other)));
+    const auto [low, high] = std::minmax({luminance(colours.at(one)), luminance(colours.at(other))});
     return (high + 0.05) / (low + 0.05);
 }
 
