@@ -174,7 +174,7 @@ public:
             session().ended = time_;
     }
 
-    // The service is killed while it plays: its stretch ends so, and of the session's end nobody knows.
+    // A kill of the service ends the stretch. Nobody tells the end of the session.
     void liveUntilTheServiceIsKilled(double begins, double plays)
     {
         const std::size_t first = weeks_.stretches.size();

@@ -4,8 +4,8 @@
 // among the user's processes the one that took the least, and among the process's shares again: start-time fair
 // queueing (P. Goyal, H. M. Vin, H. Cheng, 1996) at three levels. So a process gains nothing by many connections. Who
 // wanted nothing for a while goes on where the others are now: a pause earns no time to be used at once later, and
-// costs none. Only who was served last before a pause of all comes behind the others after it, by what that took. A
-// user who starts one process after the other may hold up the user's other processes, and nobody else's.
+// costs none. There are two limits. After a pause of all, the one that was served last comes behind the others, by the
+// time that it took. And new processes of a user may delay the older processes of that user, but not other users.
 #pragma once
 
 #include "platform/WorkQueue.h"
@@ -33,7 +33,7 @@ public:
     struct Node {
         std::shared_ptr<Node> group; // that it takes part in; null: it is the root
         Duration used{};
-        Duration now{}; // what the one in it that was served last had used before; when nobody waits, what it used
+        Duration now{}; // what the member that was served last had used before
         Contest contest; // empty in a share
     };
     // What takes part derives from this, and leaves it to this class.
