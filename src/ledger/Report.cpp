@@ -118,10 +118,13 @@ Dictionary store(const StoreState& state)
     return {{"events", state.events}, {"bytes", state.bytes}, {"oldest", seconds(state.oldest)}};
 }
 
-Dictionary now(const Account& sinceStart)
+Dictionary now(const Account& sinceStart, const Backlog& backlog)
 {
     const auto [connections, sessions] = openNow(sinceStart);
-    return {{"connections", connections}, {"sessions", sessions}};
+    return {{"connections", connections},
+            {"sessions", sessions},
+            {"waitingCalls", backlog.calls},
+            {"waitingEvents", backlog.events}};
 }
 
 Dictionary memory(const MemoryState& state)
@@ -161,7 +164,7 @@ Dictionary report(const Ledger& ledger, const ServiceProcess& process, bool with
                   {"version", process.version},
                   {"internalBuild", process.isInternalBuild},
                   {"started", seconds(process.started)},
-                  {"now", now(sinceStart)},
+                  {"now", now(sinceStart, process.backlog())},
                   {"rates", Dictionary{{"deliveries", deliveries}, {"events", events}}},
                   {"storing", process.isStoring()},
                   {"memory", memory(process.memory())}},

@@ -8,6 +8,7 @@
 #include "ledger/Ledger.h"
 
 #include <cstdint>
+#include <functional>
 #include <string>
 #include <string_view>
 
@@ -21,6 +22,12 @@ struct MemoryState {
     std::uint64_t limitOfAClient = 0;
 };
 
+// What has come in and is not done.
+struct Backlog {
+    std::uint64_t calls = 0; // that wait for the server queue or run
+    std::uint64_t events = 0; // that the store has not written
+};
+
 // The process that counts.
 struct ServiceProcess {
     std::string_view version;
@@ -28,6 +35,7 @@ struct ServiceProcess {
     double started = 0; // seconds since 1970
     bool (*isStoring)() = [] { return true; }; // whether it stores any events
     MemoryState (*memory)() = [] { return MemoryState(); };
+    std::function<Backlog()> backlog = [] { return Backlog(); };
 };
 
 // What is open, by the counts since the start of the process.

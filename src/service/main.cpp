@@ -123,7 +123,8 @@ int run()
                                          .isInternalBuild = KestoReportingUtilityIsInternalBuild(),
                                          .started = platform.platform().clock.secondsSince1970(),
                                          .isStoring = [] { return platform::current().analytics.isEnabled(); },
-                                         .memory = memoryState};
+                                         .memory = memoryState,
+                                         .backlog = [&platform] { return platform.backlog(); }};
     (*listener)->setStatus([&ledger = platform.platform().ledger, process](bool withCulprits) {
         return ledger::report(ledger, process, withCulprits);
     });

@@ -15,10 +15,12 @@ using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
 
-constexpr ServiceProcess process{.version = "1.2.3", .isInternalBuild = true, .started = 1700000000.75, .memory = [] {
-                                     return MemoryState{
-                                         .used = 5, .limit = 100, .limitOfAUser = 75, .limitOfAClient = 50};
-                                 }};
+const ServiceProcess process{
+    .version = "1.2.3",
+    .isInternalBuild = true,
+    .started = 1700000000.75,
+    .memory = [] { return MemoryState{.used = 5, .limit = 100, .limitOfAUser = 75, .limitOfAClient = 50}; },
+    .backlog = [] { return Backlog{.calls = 7, .events = 8}; }};
 
 // The value under keys within keys.
 Value at(const Dictionary& report, std::string_view path)
@@ -90,7 +92,7 @@ TEST(Report, SaysWhichProcessCountsAndSinceWhen)
     EXPECT_EQ(at(whole, "internalBuild"), Value(true));
     EXPECT_EQ(at(whole, "started").text(), "1700000000");
     EXPECT_EQ(at(whole, "began").text(), "1600000000");
-    EXPECT_EQ(at(whole, "now").text(), R"({"connections":0,"sessions":0})");
+    EXPECT_EQ(at(whole, "now").text(), R"({"connections":0,"sessions":0,"waitingCalls":7,"waitingEvents":8})");
     EXPECT_EQ(at(whole, "memory").text(), R"({"used":5,"limit":100,"limitOfAUser":75,"limitOfAClient":50})");
     EXPECT_EQ(at(whole, "store").text(), R"({"events":0,"bytes":0,"oldest":null})");
 }

@@ -56,6 +56,11 @@ LinuxPlatform::LinuxPlatform(const LaunchConfiguration& launch)
         [this] { return analytics_.isFillingUp(); });
 }
 
+ledger::Backlog LinuxPlatform::backlog()
+{
+    return {.calls = workQueues_.unfinished().ofTurnQueues, .events = analytics_.waitingEvents()};
+}
+
 void LinuxPlatform::finish()
 {
     workQueues_.finish();

@@ -8,6 +8,7 @@
 //     platform::install(providers.platform());
 #pragma once
 
+#include "ledger/Report.h"
 #include "platform/Platform.h"
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/bugs/LinuxBugCapture.h"
@@ -42,6 +43,8 @@ public:
     [[nodiscard]] AnalyticsStore& analyticsStore() noexcept { return analytics_; }
     // For the start: see LinuxFileSystem.
     void removeUnfinished(const std::filesystem::path& folder) { fileSystem_.removeUnfinished(folder); }
+    // Any thread; never waits for the disk.
+    [[nodiscard]] ledger::Backlog backlog();
     // The listener gives its descriptors to clients.
     [[nodiscard]] EmitterAccess& emitterAccess() noexcept { return emitterAccess_; }
 

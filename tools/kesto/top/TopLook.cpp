@@ -2,6 +2,7 @@
 #include "kesto/top/TopLook.h"
 
 #include "foundation/values/Json.h"
+#include "kesto/JsonValues.h"
 #include "ledger/Report.h"
 
 #include <algorithm>
@@ -16,11 +17,6 @@ namespace {
 
 constexpr double minute = 60;
 
-Value known(const std::string& text)
-{
-    return text.empty() ? Value() : Value(text);
-}
-
 Dictionary streamEntries(const PlayingStream& stream)
 {
     return {{"session", stream.session == 0 ? Value() : Value(stream.session)},
@@ -29,7 +25,7 @@ Dictionary streamEntries(const PlayingStream& stream)
             {"since", stream.since},
             {"device", known(stream.device)},
             {"format", known(stream.format)},
-            {"volume", stream.volume ? Value(*stream.volume) : Value()},
+            {"volume", valueOf(stream.volume)},
             {"faults", stream.faults}};
 }
 
@@ -106,7 +102,8 @@ std::string topJson(const TopLook& look)
     const Dictionary counts = partOf(look, "sinceStart").dictionary().value_or(Dictionary());
     const Value now = partOf(look, "now");
     const auto open = [&](std::string_view key) {
-        return now.isNull() ? Value() : Value(numberIn(*now.dictionary(), key));
+        const Value* const number = now.isNull() ? nullptr : now.dictionary()->find(key);
+        return number == nullptr ? Value() : *number; // an earlier version does not tell each
     };
     const Dictionary entries{{"time", look.time},
                              {"running", look.isRunning()},
@@ -115,6 +112,8 @@ std::string topJson(const TopLook& look)
                              {"started", partOf(look, "started")},
                              {"connections", open("connections")},
                              {"sessions", open("sessions")},
+                             {"waitingCalls", open("waitingCalls")},
+                             {"waitingEvents", open("waitingEvents")},
                              {"messagesPerSecond", look.rates ? Value(look.rates->messages) : Value()},
                              {"eventsPerSecond", look.rates ? Value(look.rates->events) : Value()},
                              {"memory", partOf(look, "memory")},

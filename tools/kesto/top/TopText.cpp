@@ -75,6 +75,10 @@ void addService(const TopLook& look, Lines& lines)
                           countedText(numberIn(status, "now.sessions"), "session")));
     lines.add(
         fmt::format("traffic   {:.1f} messages and {:.1f} events a second", look.rates->messages, look.rates->events));
+    const foundation::Dictionary now = *status.find("now")->dictionary();
+    if (now.contains("waitingCalls")) // an earlier version has none
+        lines.add(fmt::format("backlog   {} and {}", countedText(numberIn(now, "waitingCalls"), "call"),
+                              countedText(numberIn(now, "waitingEvents"), "event")));
     lines.add(fmt::format("memory    {} of at most {}", size("memory.used"), size("memory.limit")));
     const auto oldest = static_cast<double>(numberIn(status, "store.oldest"));
     lines.add(fmt::format("store     {} in {}{}", countedText(numberIn(status, "store.events"), "event"),

@@ -80,6 +80,9 @@ public:
     // Whether more than half of what may wait for the store's thread does, so that the end of a turn may block soon.
     [[nodiscard]] bool isFillingUp();
 
+    // The events that were taken and are neither committed nor counted as lost. Never waits for the disk.
+    [[nodiscard]] std::size_t waitingEvents();
+
     // The service begins to end: what connections leave behind from now on ends with it.
     void beginEnd() { keeper_->beginEnd(); }
     // Returns when everything taken so far is committed or counted as lost.

@@ -222,11 +222,13 @@ TEST_F(AnalyticsStoreTest, CountsTheEventsThatItGivesUp)
     keeper.isKeeping.get_future().wait();
     sendOne();
     sendOne();
+    EXPECT_EQ(tested.waitingEvents(), 3U);
     EXPECT_EQ(tested.giveUp(), 3U) << "one is being kept, and two wait";
     EXPECT_EQ(ledger.account()[Counter::Events], 3U);
     EXPECT_EQ(ledger.account()[Counter::LostToEnd], 3U);
     keeper.goesOn.set_value();
     tested.flush();
+    EXPECT_EQ(tested.waitingEvents(), 0U);
     EXPECT_EQ(tested.giveUp(), 0U);
 }
 

@@ -18,11 +18,17 @@ using testing::HasSubstr;
 using testing::Not;
 using testing::StartsWith;
 
-constexpr ledger::ServiceProcess process{
-    .version = "1.2.3", .isInternalBuild = true, .started = 1700000000, .memory = [] {
-        return ledger::MemoryState{
-            .used = 4'000, .limit = 64'000'000, .limitOfAUser = 48'000'000, .limitOfAClient = 32'100'000};
-    }};
+const ledger::ServiceProcess process{.version = "1.2.3",
+                                     .isInternalBuild = true,
+                                     .started = 1700000000,
+                                     .memory =
+                                         [] {
+                                             return ledger::MemoryState{.used = 4'000,
+                                                                        .limit = 64'000'000,
+                                                                        .limitOfAUser = 48'000'000,
+                                                                        .limitOfAClient = 32'100'000};
+                                         },
+                                     .backlog = [] { return ledger::Backlog{.calls = 3, .events = 5}; }};
 
 class StatusText : public testing::Test {
 protected:
@@ -170,6 +176,8 @@ TEST_F(StatusMetrics, HasTheProcessTheStoreAndAllCounters)
                           "kesto_removed_total{reason=\"size\"} 0\n"
                           "kesto_removed_total{reason=\"share\"} 0\n"
                           "kesto_removed_total{reason=\"damage\"} 0\n"));
+    EXPECT_THAT(text, HasSubstr("\nkesto_waiting_calls 3\n"));
+    EXPECT_THAT(text, HasSubstr("\nkesto_waiting_events 5\n"));
     EXPECT_THAT(text, HasSubstr("\nkesto_memory_used_bytes 4000\n"));
     EXPECT_THAT(text, HasSubstr("\nkesto_memory_limit_bytes 64000000\n"));
     EXPECT_THAT(text, HasSubstr("\nkesto_kept_total 2001204\n"));

@@ -171,6 +171,7 @@ TEST_F(TopCommand, WithoutATerminalIsOneLookWithoutEscapes)
                              "kestod [0-9.]+, running since [-0-9]+ [0-9:]+\n"
                              "clients   [12] connections?, with 0 sessions\n"
                              "traffic   [0-9.]+ messages and [0-9.]+ events a second\n"
+                             "backlog   0 calls and [0-9] events?\n"
                              "memory    [0-9.]+ [kM]?B of at most [0-9.]+ MB\n"
                              "store     [0-9] events? in [0-9.]+ [kM]?B.*\n"
                              "lost      nothing\n"
@@ -406,8 +407,8 @@ TEST_F(TopCommand, IsDrawnAgainForAnotherSize)
     kestod.startAndAwait();
     const auto screen = startScreen({"--delay", "4000"});
     screen->resize(20, 4);
-    EXPECT_TRUE(screen->waitFor("and 6 lines more")) << screen->output();
-    EXPECT_THAT(screen->output(), HasSubstr("clients   1 connect…\x1B[K\r\r\nand 6 lines more\x1B[K\x1B[J"));
+    EXPECT_TRUE(screen->waitFor("and 7 lines more")) << screen->output();
+    EXPECT_THAT(screen->output(), HasSubstr("clients   1 connect…\x1B[K\r\r\nand 7 lines more\x1B[K\x1B[J"));
 }
 
 class TopSignal : public TopCommand, public testing::WithParamInterface<int> { };

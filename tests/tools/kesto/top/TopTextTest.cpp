@@ -47,9 +47,11 @@ protected:
     }
     [[nodiscard]] TopLook look(std::vector<PlayingStream> streams = {}, double time = now, double started = 1700000000)
     {
-        const ledger::ServiceProcess service{.version = "1.2.3", .started = started, .memory = [] {
-                                                 return ledger::MemoryState{.used = 1'200'000, .limit = 268'400'000};
-                                             }};
+        const ledger::ServiceProcess service{
+            .version = "1.2.3",
+            .started = started,
+            .memory = [] { return ledger::MemoryState{.used = 1'200'000, .limit = 268'400'000}; },
+            .backlog = [] { return ledger::Backlog{.calls = 1, .events = 1'204}; }};
         TopLook look{.time = time,
                      .steadyTime = time,
                      .status = ledger::report(*ledger, service, false),
@@ -71,7 +73,7 @@ TEST_F(TopText, HasTheServiceAndWhatPlays)
     EXPECT_THAT(topLines(both, "every 2 s", {}),
                 ElementsAre("2023-11-14 22:15:30, every 2 s", "kestod 1.2.3, running since 2023-11-14 22:13:20",
                             "clients   3 connections, with 1 session", "traffic   1.5 messages and 3.0 events a second",
-                            "memory    1.2 MB of at most 268.4 MB",
+                            "backlog   1 call and 1,204 events", "memory    1.2 MB of at most 268.4 MB",
                             "store     1,204 events in 35.2 MB, the oldest of 2022-04-15 05:20:00", "lost      nothing",
                             "", "PLAYS                  SINCE      VOLUME  FAULTS  FORMAT         DEVICE",
                             "org.example.player     22:13:22     50 %       0  S16LE/44100/2  speaker",
@@ -113,7 +115,19 @@ TEST_F(TopText, SaysThatTheServiceDoesNotRunOrAnswer)
 TEST_F(TopText, SaysHowMuchWasLost)
 {
     count(Counter::LostToDiskFull, 1'204);
-    EXPECT_EQ(topLines(look(), {}, {}).at(6), "lost      1,204 since the start; kesto status says why");
+    EXPECT_EQ(topLines(look(), {}, {}).at(7), "lost      1,204 since the start; kesto status says why");
+}
+
+TEST_F(TopText, HasNoBacklogOfAnEarlierVersionWhichTellsNone)
+{
+    TopLook earlier = look();
+    foundation::Dictionary::Entries entries;
+    for (const auto& [key, value] : *earlier.status)
+        entries.push_back(
+            {key, key.view() == "now" ? foundation::Dictionary{{"connections", 3}, {"sessions", 1}} : value});
+    earlier.status = foundation::Dictionary(entries);
+    EXPECT_THAT(topLines(earlier, {}, {}), testing::Not(testing::Contains(testing::HasSubstr("backlog"))));
+    EXPECT_THAT(topJson(earlier), testing::HasSubstr(R"("sessions":1,"waitingCalls":null,"waitingEvents":null,)"));
 }
 
 TEST_F(TopText, MakesTextOfStrangersPrintable)
@@ -130,8 +144,8 @@ TEST_F(TopText, IsCutToTheTerminal)
     const auto lines =
         topLines(look({stream(1, "a", now, 0.5, 0), stream(2, "b", now, 0.5, 0)}), {}, {.width = 20, .height = 4});
     EXPECT_THAT(lines,
-                ElementsAre("2023-11-14 22:15:30", "kestod 1.2.3, runni…", "clients   3 connect…", "and 8 lines more"));
-    EXPECT_THAT(topLines(look(), {}, {.height = 1}), ElementsAre("and 9 lines more"));
+                ElementsAre("2023-11-14 22:15:30", "kestod 1.2.3, runni…", "clients   3 connect…", "and 9 lines more"));
+    EXPECT_THAT(topLines(look(), {}, {.height = 1}), ElementsAre("and 10 lines more"));
 }
 
 TEST_F(TopText, IsAsciiInOtherLocales)
@@ -218,7 +232,8 @@ TEST_F(TopLookTest, IsOneJsonObject)
 {
     EXPECT_EQ(topJson(look({stream(1, "a\"\n", 1'700'000'002.5, 0.5, 2)})),
               R"({"time":1700000130,"running":true,"statusProblem":null,"version":"1.2.3","started":1700000000,)"
-              R"("connections":3,"sessions":1,"messagesPerSecond":1.5,"eventsPerSecond":3,)"
+              R"("connections":3,"sessions":1,"waitingCalls":1,"waitingEvents":1204,)"
+              R"("messagesPerSecond":1.5,"eventsPerSecond":3,)"
               R"("memory":{"used":1200000,"limit":268400000,"limitOfAUser":0,"limitOfAClient":0},"storing":true,)"
               R"("store":{"events":1204,"bytes":35200000,"oldest":1650000000},"losses":0,)"
               R"("streams":[{"session":1,"application":"a\"\n","recording":false,"since":1700000002.5,)"
@@ -226,7 +241,8 @@ TEST_F(TopLookTest, IsOneJsonObject)
     const TopLook silent{.time = 1.5, .statusProblem = "no"};
     EXPECT_EQ(topJson(silent),
               R"({"time":1.5,"running":false,"statusProblem":"no","version":null,"started":null,)"
-              R"("connections":null,"sessions":null,"messagesPerSecond":null,"eventsPerSecond":null,)"
+              R"("connections":null,"sessions":null,"waitingCalls":null,"waitingEvents":null,)"
+              R"("messagesPerSecond":null,"eventsPerSecond":null,)"
               R"("memory":null,"storing":null,"store":null,"losses":null,"streams":null,)"
               R"("storeProblem":null})");
     TopLook blind = look();
