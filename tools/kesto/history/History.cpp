@@ -106,16 +106,18 @@ private:
             volume = std::clamp(*volume, 0.0, 1.0);
     }
 
-    void bindSpan(const SqliteStatement& statement) const
+    void bindQuestion(const SqliteStatement& statement) const
     {
         statement.bind(1, question_.span.until);
         statement.bind(2, question_.span.from);
+        if (question_.session)
+            statement.bind(3, *question_.session);
     }
 
     void readStretches()
     {
         const auto statement = database_.prepare(history_queries::stretches);
-        bindSpan(statement);
+        bindQuestion(statement);
         database_.forEachRow(statement, [this](const SqliteStatement& row) {
             const bool isInSpan = row.integer(8) != 0;
             if (isAskedFor(row) && isInSpan)
@@ -135,6 +137,8 @@ private:
         database_.forEachRow(statement, [this, isRunning](const SqliteStatement& row) {
             const double began = row.real(2);
             const double seconds = platform::lengthOfTime(began, history_.now);
+            if (question_.session && *question_.session != row.integer(0))
+                return;
             const bool isInSpan = began < question_.span.until && began + seconds > question_.span.from;
             if (isAskedFor(row) && isInSpan && (isRunning || seconds > 0))
                 add(row, seconds, isRunning ? "" : serviceEnded);
@@ -144,7 +148,7 @@ private:
     void readFaults()
     {
         const auto statement = database_.prepare(history_queries::faults);
-        bindSpan(statement);
+        bindQuestion(statement);
         database_.forEachRow(statement, [this](const SqliteStatement& row) {
             constexpr std::int64_t most = 1'000'000'000; // what a client says can still be added up
             history_.faults.push_back({.session = row.integer(0),

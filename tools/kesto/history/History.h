@@ -60,6 +60,7 @@ struct History {
 struct HistoryQuestion {
     TimeSpan span = {};
     bool isRecording = false; // what was recorded in place of what was played
+    std::optional<std::int64_t> session = {}; // only this one
     std::string applications = "*"; // GLOB
     std::string devices = "*"; // GLOB
 };

@@ -5,6 +5,7 @@
 #include "foundation/text/NumberFormatter.h"
 #include "foundation/values/Json.h"
 #include "foundation/values/Value.h"
+#include "kesto/JsonValues.h"
 #include "kesto/Terminal.h"
 #include "kesto/report/ReportCsv.h"
 
@@ -39,16 +40,6 @@ std::string utcText(double seconds)
     const auto milliseconds = static_cast<std::int64_t>(std::floor(seconds * millisecondsASecond));
     const std::chrono::sys_seconds second(std::chrono::seconds(milliseconds / millisecondsASecond));
     return fmt::format("{:%Y-%m-%dT%H:%M:%S}.{:03}Z", second, milliseconds % millisecondsASecond);
-}
-
-template <typename Number> Value valueOf(const std::optional<Number>& number)
-{
-    return number ? Value(*number) : Value();
-}
-
-Value known(std::string_view text)
-{
-    return text.empty() ? Value() : Value(text);
 }
 
 Dictionary::Entries entries(const SessionLine& line)

@@ -58,22 +58,15 @@ int showList(const SessionsOptions& options)
     return exitOk;
 }
 
-// The session alone.
-History historyOf(std::int64_t session, const SessionsOptions& options, bool isRecording)
-{
-    History history = readHistory(options.database, {.isRecording = isRecording});
-    std::erase_if(history.sessions, [session](const HistorySession& other) { return other.id != session; });
-    std::erase_if(history.stretches, [session](const PlayedStretch& other) { return other.session != session; });
-    std::erase_if(history.faults, [session](const Fault& other) { return other.session != session; });
-    return history;
-}
-
 // A session that only recorded is shown without a question.
 int showOne(std::int64_t session, const SessionsOptions& options)
 {
-    History history = historyOf(session, options, options.isRecording);
+    const auto historyOf = [&](bool isRecording) {
+        return readHistory(options.database, {.isRecording = isRecording, .session = session});
+    };
+    History history = historyOf(options.isRecording);
     if (history.stretches.empty() && !options.isRecording)
-        if (History recorded = historyOf(session, options, true); !recorded.stretches.empty())
+        if (History recorded = historyOf(true); !recorded.stretches.empty())
             history = std::move(recorded);
     const auto lines = makeSessionLines(history);
     if (lines.empty())

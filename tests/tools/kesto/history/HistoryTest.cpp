@@ -95,6 +95,22 @@ TEST_F(HistoryOfStore, HasStretchesBySessionAndTime)
     EXPECT_EQ(history.sessions[1].ended, 200);
 }
 
+TEST_F(HistoryOfStore, HasOneSessionAlone)
+{
+    for (const int session : {1, 2, 3}) {
+        store.addSession(session, "org.player", 90);
+        store.add({.session = session, .began = 100, .seconds = 10});
+        store.addFault(session, 105, "{}");
+        store.addOpen({.session = session, .began = 120}, 120);
+    }
+    store.setLastWord(130);
+    const History history = read({.session = 2});
+    EXPECT_THAT(linesOf(history),
+                ElementsAre("2 100+10 speaker S16LE/48000/2 0.5", "2 120+10 speaker S16LE/48000/2 0.5 cut off"));
+    EXPECT_THAT(history.sessions, ElementsAre(Field(&HistorySession::id, 2)));
+    EXPECT_THAT(faultsOf(history), ElementsAre("2 105 IssueDetector speaker 0"));
+}
+
 TEST_F(HistoryOfStore, HasWhatTouchesTheSpan)
 {
     store.add({.began = 100, .seconds = 10});
