@@ -3,6 +3,7 @@
 
 #include "foundation/values/Json.h"
 #include "foundation/values/Value.h"
+#include "kesto/JsonValues.h"
 #include "kesto/report/ReportTable.h"
 
 namespace {
@@ -10,11 +11,6 @@ namespace {
 using foundation::Array;
 using foundation::Dictionary;
 using foundation::Value;
-
-template <typename Number> Value valueOf(const std::optional<Number>& number)
-{
-    return number ? Value(*number) : Value();
-}
 
 Dictionary::Entries figures(const Played& played)
 {
@@ -46,9 +42,9 @@ template <typename Rows, typename Make> Array listOf(const Rows& rows, Make make
 Array lines(const Report& report, ReportBy by)
 {
     return listOf(linesOf(report, by), [by](const ReportLine& line) {
-        return by == ReportBy::Fault
-            ? Dictionary{{name(by), line.key}, {"faults", line.played.faults}, {"sessions", line.played.sessions}}
-            : withFigures({{name(by), line.key}}, line.played);
+        if (by == ReportBy::Fault)
+            return Dictionary{{name(by), line.key}, {"faults", line.played.faults}, {"sessions", line.played.sessions}};
+        return withFigures({{name(by), line.key}}, line.played);
     });
 }
 
