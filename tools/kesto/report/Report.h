@@ -59,7 +59,7 @@ struct WorstSession {
 struct Report {
     static constexpr std::size_t volumeSteps = 16; // of the slider
     static constexpr std::size_t mostWorst = 10;
-    static constexpr std::size_t mostInDays = 64; // clients choose how many applications and devices there are
+    static constexpr std::size_t mostInDays = 8; // as many as a picture tells apart
 
     TimeSpan span;
     bool isRecording = false;

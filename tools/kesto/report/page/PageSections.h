@@ -29,19 +29,3 @@ struct PageTable {
     std::vector<std::vector<std::string>> rows;
 };
 [[nodiscard]] std::string tableHTML(const PageTable& table);
-
-// Marks of an axis from 0 up: a round step, so that at most five lie above 0 and the last is not below the largest.
-struct AxisSteps {
-    double step = 1;
-    int count = 1;
-
-    [[nodiscard]] double top() const { return step * count; }
-};
-[[nodiscard]] AxisSteps stepsUpTo(double largest);
-
-// The unit in which an axis of time is readable.
-struct TimeUnit {
-    std::string_view name; // "hours"
-    double seconds = 1;
-};
-[[nodiscard]] TimeUnit unitFor(double largestSeconds);

@@ -3,6 +3,7 @@
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"
 #include "kesto/report/page/Svg.h"
+#include "kesto/report/page/TimeAxis.h"
 
 #include <algorithm>
 #include <cmath>
@@ -67,6 +68,14 @@ std::string legend(const Applications& applications)
     return html + "</ul>";
 }
 
+double longestOf(const PageColumns& columns)
+{
+    double longest = 0;
+    for (const PageColumn& column : columns.columns)
+        longest = std::max(longest, column.seconds);
+    return longest;
+}
+
 // Draws the columns side by side.
 class Bars {
 public:
@@ -77,18 +86,14 @@ public:
           hasNotes_(words.hasNotes),
           svg_(width, height,
                fmt::format("Bars of the time that was {}, by application; the table below has the figures",
-                           words.played()))
+                           words.played())),
+          axis_(longestOf(columns), {.left = left, .right = width, .top = top, .bottom = bottom})
     {
-        double largest = 0;
-        for (const PageColumn& column : columns.columns)
-            largest = std::max(largest, column.seconds);
-        unit_ = unitFor(largest);
-        steps_ = stepsUpTo(largest / unit_.seconds);
     }
 
     std::string draw()
     {
-        drawAxis();
+        axis_.draw(svg_);
         for (std::size_t index = 0; index < columns_.columns.size(); ++index) {
             drawColumn(columns_.columns[index], leftOf(index));
             drawLabel(index);
@@ -98,22 +103,6 @@ public:
 
 private:
     [[nodiscard]] double leftOf(std::size_t index) const { return left + pitch_ * static_cast<double>(index); }
-    [[nodiscard]] double heightOf(double seconds) const
-    {
-        return (bottom - top) * seconds / (unit_.seconds * steps_.top());
-    }
-
-    void drawAxis()
-    {
-        svg_.text("ax", 0, 11, Svg::Anchor::Start, unit_.name);
-        for (int step = 0; step <= steps_.count; ++step) {
-            const double value = steps_.step * step;
-            const double y = bottom - heightOf(value * unit_.seconds);
-            svg_.line(step == 0 ? "zero" : "grid", left, y, width, y);
-            svg_.text("ax", left - 8, y + 4, Svg::Anchor::End, fmt::format("{:.6g}", value));
-        }
-    }
-
     void drawColumn(const PageColumn& column, double x)
     {
         constexpr double gap = 1;
@@ -126,7 +115,7 @@ private:
         for (std::size_t index = 0; index < column.byApplication.size(); ++index) {
             if (column.byApplication[index] <= 0)
                 continue;
-            const double full = heightOf(column.byApplication[index]);
+            const double full = axis_.heightOf(column.byApplication[index]);
             svg_.bar(applications_.className(index), barLeft, y - full, barWidth, full > 3 * gap ? full - gap : full);
             y -= full;
         }
@@ -138,7 +127,7 @@ private:
 
     [[nodiscard]] std::string valueOf(double seconds) const
     {
-        const double value = seconds / unit_.seconds;
+        const double value = axis_.valueOf(seconds);
         return value < 0.05 ? "&lt;0.1" : fmt::format("{:.1f}", value);
     }
 
@@ -224,8 +213,7 @@ private:
     const double pitch_;
     const bool hasNotes_;
     Svg svg_;
-    TimeUnit unit_;
-    AxisSteps steps_;
+    const TimeAxis axis_;
 };
 
 PageTable tableOf(const PageColumns& columns, const Applications& applications)

@@ -2,6 +2,7 @@
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"
 #include "kesto/report/page/Svg.h"
+#include "kesto/report/page/TimeAxis.h"
 
 #include <algorithm>
 #include <cmath>
@@ -31,16 +32,16 @@ public:
     Histogram(const Report& report, const PageWords& words)
         : report_(report),
           hasNotes_(words.hasNotes),
-          svg_(width, height, "Bars of how long it was how loud; the table below has the figures")
+          svg_(width, height, "Bars of how long it was how loud; the table below has the figures"),
+          axis_(std::max(report.all.mutedSeconds, std::ranges::max(report.secondsAtVolume)),
+                {.left = left, .right = width, .top = top, .bottom = bottom})
     {
-        const double largest = std::max(report.all.mutedSeconds, std::ranges::max(report.secondsAtVolume));
-        unit_ = unitFor(largest);
-        steps_ = stepsUpTo(largest / unit_.seconds);
     }
 
     std::string draw()
     {
-        drawAxes();
+        axis_.draw(svg_);
+        drawScale();
         drawBar("c0", (slider + left) / 2 - mutedWidth / 2 - 6, mutedWidth, report_.all.mutedSeconds, "muted");
         const double pitch = (end - slider) / Report::volumeSteps;
         for (std::size_t step = 0; step < Report::volumeSteps; ++step)
@@ -51,20 +52,9 @@ public:
     }
 
 private:
-    [[nodiscard]] double heightOf(double seconds) const
+    // Below the bars.
+    void drawScale()
     {
-        return (bottom - top) * seconds / (unit_.seconds * steps_.top());
-    }
-
-    void drawAxes()
-    {
-        svg_.text("ax", 0, 11, Svg::Anchor::Start, unit_.name);
-        for (int step = 0; step <= steps_.count; ++step) {
-            const double value = steps_.step * step;
-            const double y = bottom - heightOf(value * unit_.seconds);
-            svg_.line(step == 0 ? "zero" : "grid", left, y, width, y);
-            svg_.text("ax", left - 6, y + 4, Svg::Anchor::End, fmt::format("{:.6g}", value));
-        }
         svg_.text("ax", (slider + left) / 2 - 6, bottom + 18, Svg::Anchor::Middle, "muted");
         for (const int percent : {0, 25, 50, 75, 100})
             svg_.text("ax", slider + (end - slider) * percent / 100, bottom + 18, Svg::Anchor::Middle,
@@ -75,7 +65,7 @@ private:
     void drawBar(const char* className, double x, double barWidth, double seconds, const std::string& name)
     {
         if (seconds > 0)
-            svg_.bar(className, x, bottom - heightOf(seconds), barWidth, heightOf(seconds),
+            svg_.bar(className, x, bottom - axis_.heightOf(seconds), barWidth, axis_.heightOf(seconds),
                      hasNotes_ ? fmt::format("{}: {}", name, durationText(seconds)) : std::string());
     }
 
@@ -94,8 +84,7 @@ private:
     const Report& report_;
     const bool hasNotes_;
     Svg svg_;
-    TimeUnit unit_;
-    AxisSteps steps_;
+    const TimeAxis axis_;
 };
 
 } // namespace

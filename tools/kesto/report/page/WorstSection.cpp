@@ -151,18 +151,25 @@ private:
 
 constexpr std::string_view dayAndTime = "{:%a %e %b, %H:%M}";
 
-// The day only if it is another than that on which it began.
-std::string endTime(double began, double ended, bool isUTC)
+// The year only if it is another than that of the report's end.
+std::string dayAndTimeText(double moment, const TimeSpan& span, bool isUTC)
 {
-    const auto dayOf = [isUTC](double moment) { return pageMoment(moment, isUTC, "{:%F}"); };
-    return pageMoment(ended, isUTC, dayOf(began) == dayOf(ended) ? "{:%H:%M}" : dayAndTime);
+    const auto yearOf = [isUTC](double time) { return pageMoment(time, isUTC, "{:%Y}"); };
+    return pageMoment(moment, isUTC, yearOf(moment) == yearOf(span.until) ? dayAndTime : "{:%a %e %b %Y, %H:%M}");
 }
 
-std::string endOf(const WorstSession& worst, const PageWords& words)
+// The day only if it is another than that on which it began.
+std::string endTime(double began, double ended, const TimeSpan& span, bool isUTC)
+{
+    const auto dayOf = [isUTC](double moment) { return pageMoment(moment, isUTC, "{:%F}"); };
+    return dayOf(began) == dayOf(ended) ? pageMoment(ended, isUTC, "{:%H:%M}") : dayAndTimeText(ended, span, isUTC);
+}
+
+std::string endOf(const WorstSession& worst, const TimeSpan& span, const PageWords& words)
 {
     return worst.isRunning    ? words.isRecording ? "still records" : "still plays"
         : worst.hasVanished   ? "vanished"
-        : worst.session.ended ? endTime(worst.session.began, *worst.session.ended, words.isUTC)
+        : worst.session.ended ? endTime(worst.session.began, *worst.session.ended, span, words.isUTC)
                               : "not told";
 }
 
@@ -182,10 +189,10 @@ std::string rowOf(const WorstSession& worst, const TimeSpan& span, const PageWor
 {
     return fmt::format("<tr><th scope=row>{}<td class=l>{}<td class=l>{}<td class=l><bdi>{}</bdi><td>{}<td>{}<td>{}"
                        "<td>{}<td class=l>{}<td class=l>{}",
-                       worst.session.id, pageMoment(worst.session.began, words.isUTC, dayAndTime), who(worst.session),
+                       worst.session.id, dayAndTimeText(worst.session.began, span, words.isUTC), who(worst.session),
                        htmlDevices(worst.devices, longestLabel), durationText(worst.played.seconds),
                        worst.played.faults, worst.lateCycles, rateText(worst.played.faultsAnHour()),
-                       Timeline(worst, span, words).draw(), endOf(worst, words));
+                       Timeline(worst, span, words).draw(), endOf(worst, span, words));
 }
 
 } // namespace

@@ -178,6 +178,15 @@ TEST(ReportPage, TellsHowTheWorstSessionsEnded)
         EXPECT_EQ(countOf(end, section), 1U) << end;
 }
 
+TEST(ReportPage, TellsTheYearOfASessionThatBeganInAnother)
+{
+    Report report = madeReport({.worst = 1});
+    EXPECT_THAT(sectionOf(reportPage(report, pageHead), "Worst sessions"), HasSubstr("<td class=l>Sun  8 Nov, 01:00<"));
+    report.worst[0].session.began -= 365 * 86400.0;
+    EXPECT_THAT(sectionOf(reportPage(report, pageHead), "Worst sessions"),
+                HasSubstr("<td class=l>Sat  8 Nov 2025, 01:00<"));
+}
+
 TEST(ReportPage, SaysThatNoSessionHadAFault)
 {
     EXPECT_THAT(sectionOf(pageOf({.worst = 0}), "Worst sessions"), HasSubstr("No session had a fault."));
