@@ -12,6 +12,16 @@
 
 namespace fs = std::filesystem;
 
+std::optional<std::string> EventStore::epoch()
+{
+    if (database_.number("SELECT count(*) FROM sqlite_schema WHERE type = 'table' AND name = 'store'") == 0)
+        return std::nullopt;
+    std::optional<std::string> epoch;
+    database_.forEachRow(database_.prepare("SELECT epoch FROM store"),
+                         [&epoch](const platform::SqliteStatement& row) { epoch = row.text(0); });
+    return epoch;
+}
+
 void EventStore::forEach(const EventFilter& filter, const std::function<void(const StoredEvent&)>& visit)
 {
     // With a second pattern SQLite does not use its index of names, so it is there only where it can match more.
@@ -20,12 +30,12 @@ void EventStore::forEach(const EventFilter& filter, const std::function<void(con
     const auto statement =
         database_.prepare(fmt::format("SELECT id, time, name, payload FROM ("
                                       " SELECT * FROM events WHERE id > ?1 AND time >= ?2 AND (name GLOB ?3{})"
-                                      " ORDER BY id DESC LIMIT ?4) ORDER BY id",
-                                      isShort ? " OR name GLOB ?5" : ""));
+                                      " ORDER BY id {} LIMIT ?4) ORDER BY id",
+                                      isShort ? " OR name GLOB ?5" : "", filter.areOldest ? "ASC" : "DESC"));
     statement.bind(1, filter.afterID);
     statement.bind(2, filter.since);
     statement.bind(3, std::string_view(filter.namePattern));
-    statement.bind(4, filter.mostRecent.value_or(-1));
+    statement.bind(4, filter.most.value_or(-1));
     if (isShort)
         statement.bind(5, std::string_view(shortPattern));
     database_.forEachRow(statement, [&visit](const platform::SqliteStatement& row) {

@@ -29,7 +29,8 @@ struct EventFilter {
     std::string namePattern = "*"; // GLOB, also of the name behind the prefix
     double since = 0; // seconds since 1970
     std::int64_t afterID = 0;
-    std::optional<std::int64_t> mostRecent; // at most this many, the most recent ones
+    std::optional<std::int64_t> most; // at most this many
+    bool areOldest = false; // the oldest of them, else the most recent ones
 };
 
 // One thread. Throws EventStoreError.
@@ -37,6 +38,8 @@ class EventStore {
 public:
     explicit EventStore(std::filesystem::path database) : database_(std::move(database)) { }
 
+    // What IDs belong to: random, and another one in another database. None in a store of the first edition.
+    [[nodiscard]] std::optional<std::string> epoch();
     // As that of the database.
     bool refresh() { return database_.refresh(); }
 

@@ -8,6 +8,7 @@
 #include "kesto/results/MomentText.h"
 
 #include <array>
+#include <charconv>
 #include <chrono>
 #include <cmath>
 #include <cstdio>
@@ -23,6 +24,7 @@ struct EventsOptions {
     std::filesystem::path database;
     EventFilter filter;
     std::string since;
+    std::optional<std::string> after; // a cursor, or empty
     bool isJson = false;
     bool isFollowing = false;
 };
@@ -82,11 +84,30 @@ private:
     const std::size_t width_ = outputWidth();
 };
 
-void printJson(const StoredEvent& event)
+// The place of an event in one database and no other: "EPOCH:ID".
+struct Cursor {
+    std::string epoch;
+    std::int64_t id = 0;
+
+    static std::optional<Cursor> parse(std::string_view text)
+    {
+        const std::size_t colon = text.find(':');
+        if (colon == 0 || colon == std::string_view::npos)
+            return std::nullopt;
+        Cursor cursor{.epoch = std::string(text.substr(0, colon))};
+        const char* const end = text.data() + text.size();
+        const auto [parsed, error] = std::from_chars(text.data() + colon + 1, end, cursor.id);
+        return error == std::errc() && parsed == end && cursor.id >= 0 ? std::optional(cursor) : std::nullopt;
+    }
+};
+
+void printJson(const StoredEvent& event, const std::optional<std::string>& epoch)
 {
     std::string name;
     foundation::appendJsonText(event.name, name);
-    fmt::print("{{\"id\":{},\"time\":{},\"name\":{},\"payload\":{}}}\n", event.id, event.time, name, event.payload);
+    const std::string cursor = epoch ? fmt::format(",\"cursor\":\"{}:{}\"", *epoch, event.id) : std::string();
+    fmt::print("{{\"id\":{},\"time\":{},\"name\":{},\"payload\":{}{}}}\n", event.id, event.time, name, event.payload,
+               cursor);
 }
 
 class EventsRun {
@@ -100,23 +121,44 @@ public:
 
     void run()
     {
+        if (options_.after)
+            goTo(*options_.after);
         if (!options_.isJson)
             table_.printHead();
-        if (filter_.mostRecent == 0)
+        if (filter_.most == 0)
             passOver();
         else
             print();
         if (!options_.isFollowing)
             return explainNothing();
-        filter_.mostRecent.reset();
+        filter_.most.reset();
         follow();
     }
 
 private:
+    // Behind the event of the cursor, or to the oldest event if the cursor is empty.
+    void goTo(const std::string& text)
+    {
+        filter_.areOldest = true;
+        const auto cursor = Cursor::parse(text);
+        if (!cursor)
+            return;
+        epoch_ = store_.epoch();
+        if (!epoch_)
+            throw EventStoreError(
+                fmt::format("the event store {} has no cursors: an earlier version of kestod made it. "
+                            "They come as soon as this version of kestod runs",
+                            printable(options_.database.native())));
+        if (cursor->epoch == *epoch_)
+            filter_.afterID = cursor->id;
+        else
+            fmt::print(stderr, "kesto: the cursor is of another event store: this one begins with its oldest event\n");
+    }
+
     // A pattern that is wrong looks like a store that is empty.
     void explainNothing() const
     {
-        if (filter_.afterID == 0 && filter_.namePattern != "*")
+        if (!options_.after && filter_.afterID == 0 && filter_.namePattern != "*")
             fmt::print(stderr, "kesto: no event{} has a name that matches '{}'\n",
                        options_.since.empty() ? "" : " of that time", printable(filter_.namePattern));
     }
@@ -124,7 +166,7 @@ private:
     // Treats all present events as seen.
     void passOver()
     {
-        filter_.mostRecent = 1;
+        filter_.most = 1;
         store_.forEach(filter_, [this](const StoredEvent& event) { filter_.afterID = event.id; });
     }
 
@@ -138,8 +180,10 @@ private:
         const DatabaseWatch watch(options_.database);
         for (std::size_t looks = 0;;) {
             try {
-                if (store_.refresh())
+                if (store_.refresh()) {
                     filter_.afterID = 0;
+                    epoch_.reset();
+                }
                 print();
             } catch (const EventStoreError&) {
                 if (looks == pauses.size())
@@ -153,10 +197,12 @@ private:
 
     void print()
     {
+        if (!epoch_) // of a store that is just being made
+            epoch_ = store_.epoch();
         store_.forEach(filter_, [this](const StoredEvent& event) {
             filter_.afterID = event.id;
             if (options_.isJson)
-                printJson(event);
+                printJson(event, epoch_);
             else
                 table_.print(event);
         });
@@ -167,6 +213,7 @@ private:
     const EventsOptions& options_;
     EventFilter filter_;
     EventStore store_;
+    std::optional<std::string> epoch_;
     EventTable table_;
 };
 
@@ -181,8 +228,13 @@ void addEventsCommand(CLI::App& application, int& exitStatus)
                         "Only events with matching names, such as '*.Volume.*' or kesto.Playback.Start");
     command->add_option("--since", options->since,
                         "Only events since then: 90s, 10m, 2h, 7d ago, or a time such as 2026-01-31T18:00:00");
-    command->add_option("--count", options->filter.mostRecent, "At most this many, the most recent ones")
+    command
+        ->add_option("--count", options->filter.most,
+                     "At most this many: the most recent ones, or with --after the oldest")
         ->check(CLI::NonNegativeNumber);
+    command->add_option(
+        "--after", options->after,
+        "Only events behind this cursor, which each line of --json has; '' begins with the oldest event");
     command->add_flag("--follow", options->isFollowing, "Print further events as they come");
     command->add_flag("--json", options->isJson, "One JSON object in each line, for programs");
     command->callback([options, &exitStatus] {
@@ -196,6 +248,12 @@ void addEventsCommand(CLI::App& application, int& exitStatus)
                                                + "\" is not a time: write 90s, 10m, 2h, 7d or 2026-01-31T18:00:00");
             options->filter.since = *since;
         }
+        if (options->after && !options->after->empty() && !Cursor::parse(*options->after))
+            throw CLI::ValidationError(
+                "--after",
+                "\"" + *options->after
+                    + "\" is not a cursor: give that of a line, such as 0a1b2c:7, or '' to begin "
+                      "with the oldest event");
         EventsRun(*options).run();
         exitStatus = exitOk;
     });

@@ -74,6 +74,13 @@ protected:
         further.insert(further.begin(), {"events", "--json"});
         return tool.print(further);
     }
+    // As the service does with a damaged one.
+    void moveStoreAway() const
+    {
+        for (const std::string file : {"", "-wal", "-shm"})
+            if (fs::exists(store.native() + file))
+                fs::rename(store.native() + file, store.native() + ".corrupt-1" + file);
+    }
     void expectFailure(const std::string& reason) const
     {
         const Finished finished = tool.run({"events", "--json"});
@@ -377,9 +384,7 @@ TEST_F(EventsCommand, FollowsTheStoreThatTakesThePlaceOfTheOneItReads)
     const auto follower = tool.start({"events", "--json", "--follow"});
     EXPECT_EQ(follower->waitForOutput("\"b\""), jsonLine(1, "a") + jsonLine(2, "b"));
     database.reset();
-    for (const std::string file : {"", "-wal", "-shm"})
-        if (fs::exists(store.native() + file))
-            fs::rename(store.native() + file, store.native() + ".corrupt-1" + file);
+    moveStoreAway();
     database = makeStore({"c"}); // step by step: for a moment it is not a store yet
     EXPECT_THAT(follower->waitForOutput("\"c\""), EndsWith(jsonLine(1, "c")));
     database->add(1000, "d");
@@ -398,11 +403,14 @@ TEST_F(EventsCommand, ReadsTheStoreOfARealService)
     const auto read = [&](Tool::Arguments further) {
         further.insert(further.begin(),
                        {"events", "--json", "--database", kestod.directory() / "state/analytics.sqlite3"});
-        return std::regex_replace(tool.print(further), std::regex(R"("time":[0-9]{10}[.0-9]*)"), R"("time":0)");
+        const std::string text =
+            std::regex_replace(tool.print(further), std::regex(R"("time":[0-9]{10}[.0-9]*)"), R"("time":0)");
+        return std::regex_replace(text, std::regex(R"("cursor":"[0-9a-f]{32}:)"), R"("cursor":"EPOCH:)");
     };
     const auto line = [](int id, const std::string& name, int number) {
         return "{\"id\":" + std::to_string(id) + ",\"time\":0,\"name\":\"com.quarn." + name
-            + "\",\"payload\":{\"a\":" + std::to_string(number) + ",\"HostApplicationDisplayID\":\"Unknown\"}}\n";
+            + "\",\"payload\":{\"a\":" + std::to_string(number)
+            + ",\"HostApplicationDisplayID\":\"Unknown\"},\"cursor\":\"EPOCH:" + std::to_string(id) + "\"}\n";
     };
     const std::string own = "kesto.Playback.Start";
     const std::string ofService = "standalone.Playback.Start";
@@ -410,6 +418,77 @@ TEST_F(EventsCommand, ReadsTheStoreOfARealService)
     EXPECT_EQ(read({"--name", "*.standalone.*"}), line(2, ofService, 1) + line(4, ofService, 2));
     EXPECT_EQ(read({"--count", "1"}), line(4, ofService, 2));
     EXPECT_EQ(read({"--since", "9999-01-31"}), "");
+}
+
+// --- cursors
+
+class EventsBehindACursor : public EventsCommand {
+protected:
+    // A database as the service makes it now, as far as cursors concern it.
+    void makeStoreOf(const std::string& epoch, const std::vector<std::string>& names)
+    {
+        database = makeStore(names);
+        database->execute("CREATE TABLE store(epoch TEXT NOT NULL) STRICT; INSERT INTO store VALUES ('" + epoch + "')");
+    }
+    static std::string line(int id, const std::string& name, const std::string& epoch = "e1")
+    {
+        std::string text = jsonLine(id, name);
+        return text.insert(text.size() - 2, ",\"cursor\":\"" + epoch + ":" + std::to_string(id) + "\"");
+    }
+
+    std::unique_ptr<Database> database;
+};
+
+TEST_F(EventsBehindACursor, AreReadPieceByPieceFromTheOldestOne)
+{
+    makeStoreOf("e1", {"a", "b", "c", "d", "e"});
+    EXPECT_EQ(printJson({"--after", "", "--count", "2"}), line(1, "a") + line(2, "b"));
+    EXPECT_EQ(printJson({"--after", "e1:2", "--count", "2"}), line(3, "c") + line(4, "d"));
+    EXPECT_EQ(printJson({"--after", "e1:4", "--count", "2"}), line(5, "e"));
+    EXPECT_EQ(printJson({"--after", "e1:5", "--count", "2"}), "");
+    database->add(1000, "f");
+    EXPECT_EQ(printJson({"--after", "e1:5", "--name", "[ef]"}), line(6, "f"));
+}
+
+TEST_F(EventsBehindACursor, AreAllOfAnotherDatabaseThatTookThePlaceOfTheFirst)
+{
+    makeStoreOf("e2", {"a", "b"});
+    const Finished finished = tool.run({"events", "--json", "--after", "e1:1"});
+    EXPECT_EQ(finished.output, line(1, "a", "e2") + line(2, "b", "e2"));
+    EXPECT_EQ(finished.errors, "kesto: the cursor is of another event store: this one begins with its oldest event\n");
+    EXPECT_EQ(finished.status, 0);
+}
+
+TEST_F(EventsBehindACursor, AreThoseOfTheNewDatabaseOnceItTakesThePlaceOfTheOneThatIsFollowed)
+{
+    makeStoreOf("e1", {"a", "b"});
+    const auto follower = tool.start({"events", "--json", "--follow", "--after", "e1:1"});
+    EXPECT_EQ(follower->waitForOutput("\"b\""), line(2, "b"));
+    const fs::path next = directory.path() / "state/next.sqlite3";
+    makeStore(next, {"c"})->execute("CREATE TABLE store(epoch TEXT NOT NULL) STRICT; INSERT INTO store VALUES ('e2')");
+    database.reset();
+    moveStoreAway();
+    fs::rename(next, store);
+    EXPECT_EQ(follower->waitForOutput("\"c\""), line(2, "b") + line(1, "c", "e2"));
+}
+
+TEST_F(EventsBehindACursor, AreNotToldOfAStoreWithoutCursors)
+{
+    const auto first = makeStore({"a"});
+    EXPECT_EQ(printJson({"--after", ""}), jsonLine(1, "a"));
+    const Finished finished = tool.run({"events", "--after", "e1:1"});
+    EXPECT_EQ(finished.status, 1);
+    EXPECT_THAT(finished.errors, HasSubstr(" has no cursors: an earlier version of kestod made it."));
+}
+
+TEST_F(EventsBehindACursor, AreNotReadForWhatIsNoCursor)
+{
+    makeStoreOf("e1", {"a"});
+    for (const char* wrong : {"7", ":7", "e1:", "e1:x", "e1:7x", "e1:-1"}) {
+        const Finished finished = tool.run({"events", "--after", wrong});
+        EXPECT_NE(finished.status, 0) << wrong;
+        EXPECT_THAT(finished.errors, HasSubstr(std::string("\"") + wrong + "\" is not a cursor: give that of a line"));
+    }
 }
 
 TEST_F(EventsCommand, FollowsARealService)
