@@ -17,6 +17,7 @@ using foundation::Dictionary;
 using foundation::Value;
 using support::playback;
 using support::typeStart;
+using support::typeStop;
 using testing::ElementsAre;
 using testing::Field;
 using testing::HasSubstr;
@@ -24,7 +25,6 @@ using testing::IsEmpty;
 using testing::MatchesRegex;
 using testing::SizeIs;
 
-constexpr int typeStop = 2;
 constexpr std::string_view uptimeEvent = "com.quarn.kesto.kestoreportingclientuptime";
 
 Array success(std::uint64_t call)

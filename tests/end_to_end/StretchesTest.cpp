@@ -18,16 +18,15 @@ namespace {
 using foundation::Array;
 using foundation::Dictionary;
 using support::playback;
+using support::routeChange;
+using support::setup;
+using support::typeDeactivate;
 using support::typeStart;
+using support::typeState;
+using support::typeStop;
+using support::volume;
 using testing::ElementsAre;
 using testing::IsEmpty;
-
-constexpr int setup = 8;
-constexpr int routeChange = 10;
-constexpr int volume = 14;
-constexpr int typeStop = 2;
-constexpr int typeDeactivate = 4;
-constexpr int typeState = 18;
 
 const std::string rows = "SELECT printf('%g s on %s at %s: %s', round(seconds, 3), coalesce(device, '?'),"
                          " coalesce(volume, '?'), ending) FROM stretches ORDER BY id";

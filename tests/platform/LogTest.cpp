@@ -39,10 +39,11 @@ std::uint64_t reportedIn(const std::vector<support::LogLine>& lines)
         if (!line.message.starts_with(begin))
             continue;
         const std::uint64_t leftOut = std::stoull(line.message.substr(begin.size()));
-        EXPECT_THAT(line, IsLine(LogLevel::Error, "log",
-                                 fmt::format("client 7 made too many log lines: {} were left out; it may have 2000 at "
-                                             "once and 50 a second",
-                                             leftOut)));
+        EXPECT_THAT(line,
+                    IsLine(LogLevel::Error, "log",
+                           fmt::format("client 7 made too many log lines: {} were left out; it may have 2000 at "
+                                       "once and 50 a second",
+                                       leftOut)));
         sum += leftOut;
     }
     return sum;

@@ -1,6 +1,7 @@
 // `kesto report` as it is shipped, on a store in the service's schema and beside a real service.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
+#include "support/MessageKinds.h"
 #include "tools/kesto/Tool.h"
 #include "tools/kesto/history/MadeStore.h"
 
@@ -205,13 +206,9 @@ TEST(ReportOfAService, CountsWhatRunsUpToNowAndWhatWasKilledUpToItsLastWord)
     const auto send = [&](int category, int type, const Dictionary& message) {
         client.ask(WireMethod::SendMessage, message, category, type, Array{session});
     };
-    constexpr int error = 11;
-    constexpr int issueDetector = 7;
-    constexpr int playbackCategory = 4;
-    constexpr int start = 1;
-    send(playbackCategory, start,
+    send(support::playback, support::typeStart,
          {{"session_output_running", true}, {"active_devices", "null-sink"}, {"PomoSessionVolume", 0.5}});
-    send(error, issueDetector, {{"issue", "late_cycles"}, {"late_cycles", 3}});
+    send(support::error, support::typeIssueDetector, {{"issue", "late_cycles"}, {"late_cycles", 3}});
     EXPECT_THAT(print({}),
                 MatchesRegex("[0-9]+ s played in 1 session; 1 fault; 1 still running\n"
                              "DAY           PLAYED\n(.|\n)*"

@@ -46,7 +46,8 @@ protected:
               {"kestoreporting_timestamp", began}});
         send(client, 14, 18, {{"PomoSessionVolume", 0.75}, {"kestoreporting_timestamp", began + 5}});
         if (stops)
-            send(client, playback, 2, {{"session_output_running", false}, {"kestoreporting_timestamp", began + 10}});
+            send(client, playback, support::typeStop,
+                 {{"session_output_running", false}, {"kestoreporting_timestamp", began + 10}});
     }
     static void send(WireClient& client, int category, int type, const Dictionary& message)
     {

@@ -34,17 +34,17 @@ using foundation::Array;
 using foundation::Dictionary;
 using sdk_test::FakeService;
 using sdk_test::Peer;
+using support::error;
 using support::playback;
+using support::typeIssueDetector;
 using support::typeStart;
+using support::typeState;
+using support::typeStop;
+using support::volume;
 using testing::HasSubstr;
 using testing::MatchesRegex;
 using testing::Not;
 
-constexpr int error = 11;
-constexpr int volume = 14;
-constexpr int typeStop = 2;
-constexpr int typeIssueDetector = 7;
-constexpr int typeState = 18;
 constexpr std::string_view shownScreen = "\x1B[?1049h"; // the alternate screen
 constexpr std::string_view hiddenScreen = "\x1B[?25h\x1B[?1049l"; // the cursor, and the screen of before
 
