@@ -167,6 +167,7 @@ Dictionary report(const Ledger& ledger, const ServiceProcess& process, bool with
                   {"now", now(sinceStart, process.backlog())},
                   {"rates", Dictionary{{"deliveries", deliveries}, {"events", events}}},
                   {"storing", process.isStoring()},
+                  {"storingStretches", process.isStoringStretches()},
                   {"memory", memory(process.memory())}},
                  ledger.account(), withCulprits, countsOfRun(ledger, sinceStart, withCulprits));
 }
@@ -180,6 +181,7 @@ Dictionary report(const Account& account, bool withCulprits)
                   {"now", {}},
                   {"rates", {}},
                   {"storing", {}},
+                  {"storingStretches", {}},
                   {"memory", {}}},
                  account, withCulprits, {});
 }

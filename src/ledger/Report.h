@@ -34,6 +34,7 @@ struct ServiceProcess {
     bool isInternalBuild = false;
     double started = 0; // seconds since 1970
     bool (*isStoring)() = [] { return true; }; // whether it stores any events
+    std::function<bool()> isStoringStretches = [] { return true; };
     MemoryState (*memory)() = [] { return MemoryState(); };
     std::function<Backlog()> backlog = [] { return Backlog(); };
 };

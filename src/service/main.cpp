@@ -119,12 +119,14 @@ int run()
     (*listener)->setMemory(platform.platform().memory);
     const auto service = KestoReportingServiceDelegate::make();
     (*listener)->setDelegate(*service);
-    const ledger::ServiceProcess process{.version = KESTO_VERSION,
-                                         .isInternalBuild = KestoReportingUtilityIsInternalBuild(),
-                                         .started = platform.platform().clock.secondsSince1970(),
-                                         .isStoring = [] { return platform::current().analytics.isEnabled(); },
-                                         .memory = memoryState,
-                                         .backlog = [&platform] { return platform.backlog(); }};
+    const ledger::ServiceProcess process{
+        .version = KESTO_VERSION,
+        .isInternalBuild = KestoReportingUtilityIsInternalBuild(),
+        .started = platform.platform().clock.secondsSince1970(),
+        .isStoring = [] { return platform::current().analytics.isEnabled(); },
+        .isStoringStretches = [&platform] { return platform.analyticsStore().keepsStretches(); },
+        .memory = memoryState,
+        .backlog = [&platform] { return platform.backlog(); }};
     (*listener)->setStatus([&ledger = platform.platform().ledger, process](bool withCulprits) {
         return ledger::report(ledger, process, withCulprits);
     });

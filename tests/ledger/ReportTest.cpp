@@ -50,8 +50,9 @@ std::vector<std::string> keys(const Dictionary& dictionary)
 
 bool isOnlyOfTheWhole(const std::string& key)
 {
-    static const std::set<std::string> keys{"running", "version", "internalBuild", "started", "now",    "rates",
-                                            "storing", "memory",  "began",         "store",   "stored", "sinceStart"};
+    static const std::set<std::string> keys{"running", "version", "internalBuild",    "started", "now",
+                                            "rates",   "storing", "storingStretches", "memory",  "began",
+                                            "store",   "stored",  "sinceStart"};
     return keys.contains(key);
 }
 
@@ -60,10 +61,10 @@ TEST(Report, HasTheKeysThatProgramsReadInTheirOrder)
 {
     const Dictionary whole = report(Ledger(), process, true);
     const std::vector<std::string> expected{
-        "running",  "version",  "internalBuild", "started",    "now",      "rates",       "storing",   "memory",
-        "began",    "store",    "stored",        "deliveries", "recorded", "repeated",    "inert",     "refused",
-        "events",   "kept",     "unwanted",      "lost",       "removed",  "connections", "frames",    "calls",
-        "sessions", "channels", "captures",      "traces",     "log",      "who",         "sinceStart"};
+        "running", "version",  "internalBuild", "started",  "now",        "rates",    "storing",     "storingStretches",
+        "memory",  "began",    "store",         "stored",   "deliveries", "recorded", "repeated",    "inert",
+        "refused", "events",   "kept",          "unwanted", "lost",       "removed",  "connections", "frames",
+        "calls",   "sessions", "channels",      "captures", "traces",     "log",      "who",         "sinceStart"};
     std::vector<std::string> found = keys(whole);
     std::erase_if(found, [&](const std::string& key) { return std::ranges::find(expected, key) == expected.end(); });
     EXPECT_EQ(found, expected);
@@ -103,7 +104,8 @@ TEST(Report, WithoutAProcessHasNullForWhatOnlyAProcessHas)
     const Dictionary whole = report(*accountIn(image), false);
     EXPECT_EQ(at(whole, "running"), Value(false));
     EXPECT_EQ(at(whole, "began"), Value(1600000000));
-    for (const char* key : {"version", "internalBuild", "started", "now", "rates", "storing", "memory", "sinceStart"})
+    for (const char* key :
+         {"version", "internalBuild", "started", "now", "rates", "storing", "storingStretches", "memory", "sinceStart"})
         EXPECT_EQ(at(whole, key), Value()) << key;
 }
 

@@ -60,6 +60,13 @@ private:
         return ledger::countedText(numberIn(report_, path), one);
     }
 
+    // Not of an earlier version, which does not tell it.
+    [[nodiscard]] bool isOff(std::string_view key) const
+    {
+        const auto* const value = report_.find(key);
+        return value != nullptr && !value->asBoolean();
+    }
+
     [[nodiscard]] std::string size(std::string_view path) const { return sizeText(numberIn(report_, path)); }
 
     void addHead()
@@ -82,9 +89,10 @@ private:
         const std::uint64_t oldest = numberIn(report_, "store.oldest");
         addLine(fmt::format("the store has {} in {}{}", counted("store.events", "event"), size("store.bytes"),
                             oldest == 0 ? "" : ", the oldest of " + moment(oldest)));
-        if (const auto* const storing = report_.find("storing");
-            isRunning_ && storing != nullptr && !storing->asBoolean())
+        if (isRunning_ && isOff("storing"))
             addLine(nothingIsStored);
+        else if (isRunning_ && isOff("storingStretches"))
+            addLine(noStretchesAreStored);
     }
 
     void addRow(std::string_view name, std::string_view ofRun, std::string_view ofAll, std::string_view rest = {})

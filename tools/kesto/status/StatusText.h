@@ -8,6 +8,7 @@
 #include <string_view>
 
 // What a person reads while `enabled = false` stands there.
+constexpr std::string_view noStretchesAreStored = "no playing times are stored: analytics.toml says stretches = false";
 constexpr std::string_view nothingIsStored = "no event is stored: analytics.toml says enabled = false";
 
 // Tables of what the service counted, cut to the width.

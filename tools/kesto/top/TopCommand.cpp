@@ -124,7 +124,7 @@ private:
         look.time = Seconds(std::chrono::system_clock::now().time_since_epoch()).count();
         look.steadyTime = Seconds(Clock::now().time_since_epoch()).count();
         look.rates = ratesOf(look, look_ ? &*look_ : nullptr);
-        if (look.isStoring())
+        if (look.isStoringStretches())
             readStreams(look);
         look_ = std::move(look);
         return true;

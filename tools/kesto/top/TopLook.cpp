@@ -29,6 +29,13 @@ Dictionary streamEntries(const PlayingStream& stream)
             {"faults", stream.faults}};
 }
 
+// True also of an earlier version, which does not tell it.
+bool isTold(const Dictionary& status, std::string_view key)
+{
+    const Value* const told = status.find(key);
+    return told == nullptr || told->asBoolean();
+}
+
 Value partOf(const TopLook& look, std::string_view key)
 {
     const Value* const part = look.status ? look.status->find(key) : nullptr;
@@ -55,10 +62,12 @@ bool TopLook::isRunning() const
 
 bool TopLook::isStoring() const
 {
-    if (!isRunning())
-        return false;
-    const Value* const storing = status->find("storing");
-    return storing == nullptr || storing->asBoolean(); // an earlier version does not tell it
+    return isRunning() && isTold(*status, "storing");
+}
+
+bool TopLook::isStoringStretches() const
+{
+    return isStoring() && isTold(*status, "storingStretches");
 }
 
 std::optional<TopRates> ratesOf(const TopLook& look, const TopLook* before)
@@ -118,6 +127,7 @@ std::string topJson(const TopLook& look)
                              {"eventsPerSecond", look.rates ? Value(look.rates->events) : Value()},
                              {"memory", partOf(look, "memory")},
                              {"storing", partOf(look, "storing")},
+                             {"storingStretches", partOf(look, "storingStretches")},
                              {"store", partOf(look, "store")},
                              {"losses", look.isRunning() ? Value(ledger::lossesIn(counts)) : Value()},
                              {"streams", streamsOf(look)},

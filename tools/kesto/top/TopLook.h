@@ -28,8 +28,9 @@ struct TopLook {
     std::string storeProblem = {}; // why, if the store could not be read
 
     [[nodiscard]] bool isRunning() const;
-    // Whether the store tells what plays: what a killed service left in it plays no more.
+    // Whether the store is kept up to date: what a killed service left in it plays no more.
     [[nodiscard]] bool isStoring() const;
+    [[nodiscard]] bool isStoringStretches() const;
 };
 
 // Between two looks at one run of the service, else those of its last minute; none if it does not run.

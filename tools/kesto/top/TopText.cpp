@@ -91,6 +91,8 @@ void addService(const TopLook& look, Lines& lines)
                   Paint::Warning);
     if (!look.isStoring())
         lines.add(nothingIsStored, Paint::Warning);
+    else if (!look.isStoringStretches())
+        lines.add(noStretchesAreStored, Paint::Warning);
 }
 
 void addRow(std::string_view application, std::string_view since, std::string_view volume, std::string_view faults,

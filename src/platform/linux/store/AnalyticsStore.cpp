@@ -205,6 +205,7 @@ void AnalyticsStore::applyConfiguration()
         auto checked = readAnalyticsConfiguration(configurationFile_.values());
         names_.setPatterns(checked.configuration.enabled ? checked.configuration.used : std::vector<std::string>());
         isEnabled_ = checked.configuration.enabled;
+        keepsStretches_ = checked.configuration.stretches;
         newConfiguration_ = std::move(checked.configuration);
         problems = std::move(checked.problems);
         wakeKeeper();

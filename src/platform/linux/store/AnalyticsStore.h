@@ -62,6 +62,8 @@ public:
     ~AnalyticsStore() override;
 
     [[nodiscard]] bool isEnabled() const override { return isEnabled_.load(std::memory_order_relaxed); }
+    // Whether it keeps who played what for how long.
+    [[nodiscard]] bool keepsStretches() const { return isEnabled() && keepsStretches_.load(std::memory_order_relaxed); }
     [[nodiscard]] bool isAnalyticsEventUsed(std::string_view eventName) override { return names_.contains(eventName); }
     // Both stamp the event with the time and build its payload before they return. They block only while too much waits
     // to be written. An event of a turn is written when the turn has ended or is too large, any other event as soon as
@@ -131,6 +133,7 @@ private:
     const EventBatch::PayloadFilter filter_; // by the rules; empty: none apply
     UsedEventNames names_;
     std::atomic<bool> isEnabled_ = true;
+    std::atomic<bool> keepsStretches_ = true;
     // Only for the store's thread.
     std::optional<ledger::StoreState> lastState_;
     std::uint64_t storedByLedger_; // the events that are in the store according to the ledger

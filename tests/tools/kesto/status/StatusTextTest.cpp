@@ -132,6 +132,15 @@ TEST_F(StatusText, SaysThatTheServiceDoesNotRun)
     EXPECT_THAT(text, HasSubstr("  kept                                                       2,001,204\n"));
 }
 
+TEST_F(StatusText, SaysThatPlayingTimesAreNotStored)
+{
+    constexpr std::string_view line = "\nno playing times are stored: analytics.toml says stretches = false\n";
+    EXPECT_THAT(statusText(running(), std::string::npos), Not(HasSubstr(line)));
+    ledger::ServiceProcess without = process;
+    without.isStoringStretches = [] { return false; };
+    EXPECT_THAT(statusText(ledger::report(*ledger, without, false), std::string::npos), HasSubstr(line));
+}
+
 TEST_F(StatusText, SaysNothingOfMemoryForAServiceOfAnEarlierVersion)
 {
     Dictionary::Entries entries;

@@ -303,6 +303,15 @@ TEST_F(TopCommand, OfAServiceThatStoresNothingDoesNotSayThatNothingPlays)
     EXPECT_THAT(tool.print({"top"}), testing::EndsWith("\nno event is stored: analytics.toml says enabled = false\n"));
 }
 
+TEST_F(TopCommand, SaysThatPlayingTimesAreNotStored)
+{
+    support::writeFile(kestod.directory() / "configuration" / "analytics.toml", "stretches = false\n");
+    kestod.startAndAwait();
+    EXPECT_TRUE(json()["streams"].IsNull());
+    EXPECT_THAT(tool.print({"top"}),
+                testing::EndsWith("\nno playing times are stored: analytics.toml says stretches = false\n"));
+}
+
 TEST_F(TopCommand, DoesNotKnowWhatPlaysWithoutTheService)
 {
     EXPECT_THAT(tool.run({"top", "--json"}).output, HasSubstr("\"streams\":null"));

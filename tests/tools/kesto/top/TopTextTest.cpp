@@ -230,20 +230,21 @@ TEST_F(TopLookTest, SortsStreams)
 
 TEST_F(TopLookTest, IsOneJsonObject)
 {
-    EXPECT_EQ(topJson(look({stream(1, "a\"\n", 1'700'000'002.5, 0.5, 2)})),
-              R"({"time":1700000130,"running":true,"statusProblem":null,"version":"1.2.3","started":1700000000,)"
-              R"("connections":3,"sessions":1,"waitingCalls":1,"waitingEvents":1204,)"
-              R"("messagesPerSecond":1.5,"eventsPerSecond":3,)"
-              R"("memory":{"used":1200000,"limit":268400000,"limitOfAUser":0,"limitOfAClient":0},"storing":true,)"
-              R"("store":{"events":1204,"bytes":35200000,"oldest":1650000000},"losses":0,)"
-              R"("streams":[{"session":1,"application":"a\"\n","recording":false,"since":1700000002.5,)"
-              R"("device":"speaker","format":"S16LE/44100/2","volume":0.5,"faults":2}],"storeProblem":null})");
+    EXPECT_EQ(
+        topJson(look({stream(1, "a\"\n", 1'700'000'002.5, 0.5, 2)})),
+        R"({"time":1700000130,"running":true,"statusProblem":null,"version":"1.2.3","started":1700000000,)"
+        R"("connections":3,"sessions":1,"waitingCalls":1,"waitingEvents":1204,)"
+        R"("messagesPerSecond":1.5,"eventsPerSecond":3,)"
+        R"("memory":{"used":1200000,"limit":268400000,"limitOfAUser":0,"limitOfAClient":0},"storing":true,"storingStretches":true,)"
+        R"("store":{"events":1204,"bytes":35200000,"oldest":1650000000},"losses":0,)"
+        R"("streams":[{"session":1,"application":"a\"\n","recording":false,"since":1700000002.5,)"
+        R"("device":"speaker","format":"S16LE/44100/2","volume":0.5,"faults":2}],"storeProblem":null})");
     const TopLook silent{.time = 1.5, .statusProblem = "no"};
     EXPECT_EQ(topJson(silent),
               R"({"time":1.5,"running":false,"statusProblem":"no","version":null,"started":null,)"
               R"("connections":null,"sessions":null,"waitingCalls":null,"waitingEvents":null,)"
               R"("messagesPerSecond":null,"eventsPerSecond":null,)"
-              R"("memory":null,"storing":null,"store":null,"losses":null,"streams":null,)"
+              R"("memory":null,"storing":null,"storingStretches":null,"store":null,"losses":null,"streams":null,)"
               R"("storeProblem":null})");
     TopLook blind = look();
     blind.streams.reset();
