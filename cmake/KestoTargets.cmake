@@ -21,9 +21,14 @@ add_compile_definitions($<$<CONFIG:Debug>:_GLIBCXX_ASSERTIONS>)
 
 # Locks are annotated; clang proves that guarded data is used only while the lock is held. g++'s own <algorithm> uses
 # deprecated functions, for which only clang warns; g++ itself warns of the project's uses.
-add_compile_options(-Wall -Wextra -Wpedantic -Werror -Wshadow -Wimplicit-fallthrough
+add_compile_options(-Wall -Wextra -Wpedantic -Wshadow -Wimplicit-fallthrough $<$<BOOL:${KESTO_WERROR}>:-Werror>
                     $<$<COMPILE_LANGUAGE:CXX>:-Wnon-virtual-dtor> $<$<COMPILE_LANGUAGE:CXX>:-Wold-style-cast>
                     $<$<CXX_COMPILER_ID:Clang>:-Wthread-safety> $<$<CXX_COMPILER_ID:Clang>:-Wno-deprecated-declarations>)
+
+# A build from another place gives the same files. Debug builds keep the places, so that a debugger finds the sources.
+set(CMAKE_BUILD_RPATH_USE_ORIGIN ON)
+add_compile_options("$<$<NOT:$<CONFIG:Debug>>:-ffile-prefix-map=${PROJECT_SOURCE_DIR}=.>"
+                    "$<$<NOT:$<CONFIG:Debug>>:-ffile-prefix-map=${PROJECT_BINARY_DIR}=./build>")
 
 # A program is linked only with those libraries of its layers that it uses.
 add_link_options(-Wl,--as-needed)

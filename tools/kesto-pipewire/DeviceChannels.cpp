@@ -4,6 +4,8 @@
 #include "kesto-pipewire/DriverName.h"
 #include "kesto-pipewire/ValidText.h"
 
+#include <fmt/format.h>
+
 #include <algorithm>
 #include <cerrno>
 #include <chrono>
@@ -171,7 +173,7 @@ std::string DeviceChannels::freeSubgroup(const std::string& name) const
     const auto essence = essenceOf(name);
     const std::string_view wanted = essence.empty() || essence == "-" ? "unnamed" : std::string_view(name);
     for (std::size_t number = 1;; ++number) {
-        const auto suffix = number == 1 ? "" : "#" + std::to_string(number);
+        const auto suffix = number == 1 ? std::string() : fmt::format("#{}", number);
         auto subgroup = tidyText(wanted, maximumNameBytes - suffix.size()) + suffix;
         const auto isTaken = [taken = essenceOf(subgroup)](const auto& each) {
             return essenceOf(each.second.subgroup) == taken;

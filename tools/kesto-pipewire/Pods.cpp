@@ -2,6 +2,7 @@
 // these.
 #include "kesto-pipewire/Pods.h"
 
+#include <fmt/format.h>
 #include <spa/debug/types.h>
 #include <spa/param/audio/format.h>
 #include <spa/param/audio/type-info.h>
@@ -177,9 +178,9 @@ std::optional<StreamFormat> readFormat(const spa_pod& format)
     else
         result.text = shortName(spa_type_media_subtype, readID(format, SPA_FORMAT_mediaSubtype).value_or(0));
     if (const auto rate = readInteger(format, SPA_FORMAT_AUDIO_rate))
-        result.text += "/" + std::to_string(*rate);
+        result.text += fmt::format("/{}", *rate);
     if (const auto channels = readInteger(format, SPA_FORMAT_AUDIO_channels)) {
-        result.text += "/" + std::to_string(*channels);
+        result.text += fmt::format("/{}", *channels);
         result.channels = *channels;
     }
     return result;

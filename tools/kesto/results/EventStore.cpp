@@ -63,6 +63,5 @@ bool DatabaseWatch::wait(std::optional<std::chrono::milliseconds> limit) const
     if (::poll(&watched, 1, limit ? static_cast<int>(limit->count()) : -1) <= 0)
         return false;
     alignas(inotify_event) std::array<char, 16 * (sizeof(inotify_event) + NAME_MAX + 1)> events;
-    static_cast<void>(::read(inotify_, events.data(), events.size()));
-    return true;
+    return ::read(inotify_, events.data(), events.size()) > 0;
 }
