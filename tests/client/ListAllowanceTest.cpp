@@ -25,7 +25,7 @@ TEST_F(ListTest, DescribesOneMoreSessionAfterExactly24KibibytesOfDescriptionsAnd
 {
     constexpr std::size_t sessionsOf24Kibibytes = 96;
     constexpr std::size_t bytesOfADescription = 256;
-    KestoReportingServiceDelegateProtocol::Sessions sessions;
+    std::vector<std::shared_ptr<KestoReportingSession>> sessions;
     const auto addSession = [&](std::int64_t reporterID) {
         sessions.push_back(std::make_shared<KestoReportingSession>(reporterID, std::vector<std::int32_t>{1001}));
         sessions.back()->setConfiguration(Dictionary{{"HostApplicationDisplayID", std::string(173, 'x')}});
@@ -33,12 +33,15 @@ TEST_F(ListTest, DescribesOneMoreSessionAfterExactly24KibibytesOfDescriptionsAnd
     };
     for (std::size_t count = 0; count < sessionsOf24Kibibytes; ++count)
         addSession(100);
+    const auto describe = [&] {
+        return client::descriptionOfSessions(sessions.size(), [next = sessions.begin()]() mutable { return *next++; });
+    };
     addSession(201);
-    EXPECT_THAT(client::descriptionOfSessions(sessions), EndsWith("xxx,started=0\"]"));
-    EXPECT_THAT(client::descriptionOfSessions(sessions), HasSubstr("\"reporterID=201,"));
+    EXPECT_THAT(describe(), EndsWith("xxx,started=0\"]"));
+    EXPECT_THAT(describe(), HasSubstr("\"reporterID=201,"));
     addSession(202);
-    EXPECT_THAT(client::descriptionOfSessions(sessions), HasSubstr("\"reporterID=201,"));
-    EXPECT_THAT(client::descriptionOfSessions(sessions), EndsWith("xxx,started=0\",\"... 1 more\"]"));
+    EXPECT_THAT(describe(), HasSubstr("\"reporterID=201,"));
+    EXPECT_THAT(describe(), EndsWith("xxx,started=0\",\"... 1 more\"]"));
 }
 
 // --- the lists of a minute
