@@ -138,6 +138,55 @@ TEST_F(ListAllowanceTest, IsSharedByAllClientsSoThatNoneGetsMoreByConnectingAgai
     EXPECT_LT(bytes, allowance + everythingElse);
 }
 
+// --- many lists
+
+// Each reading of the clock takes longer than a slice of the server queue's time.
+class SlowListsTest : public ListAllowanceTest {
+protected:
+    SlowListsTest()
+    {
+        harness.forget();
+        harness.platform.clock.setPaceOfSystemUptime(0.001);
+    }
+
+    // The lines that list sessions when another client's call is answered.
+    std::vector<std::string> listedBeforeTheNextAnswer()
+    {
+        const auto other = recorder.submit(GetServiceNameForReporterID, {0});
+        while (recorder.answersTo(other) == unanswered)
+            EXPECT_TRUE(harness.platform.workQueues.runOne());
+        std::vector<std::string> lines;
+        for (const LogLine& line : harness.platform.log.lines())
+            if (line.message.contains("essions for client") || line.message.contains("active reporting session"))
+                lines.push_back(line.message.substr(0, line.message.find(" [")));
+        return lines;
+    }
+};
+
+TEST_F(SlowListsTest, LetTheCallsOfOthersGoInBetweenAtAStop)
+{
+    const auto stopped = player.submit(StopReportingSessionForID, {1});
+    EXPECT_THAT(listedBeforeTheNextAnswer(), testing::ElementsAre("sessions for client 1001 :"));
+    EXPECT_EQ(player.answersTo(stopped), unanswered);
+    harness.platform.workQueues.runAll();
+    EXPECT_THAT(listedBeforeTheNextAnswer(),
+                testing::ElementsAre(
+                    "sessions for client 1001 :", "sessions for client 1002 :", "0 active reporting session(s)"));
+    EXPECT_EQ(player.answersTo(stopped), answeredOnce(succeeded));
+}
+
+TEST_F(SlowListsTest, LetTheCallsOfOthersGoInBetweenAtAMessageToAll)
+{
+    const auto sent = player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    EXPECT_THAT(listedBeforeTheNextAnswer(), testing::ElementsAre("sessions for client 1001 :"));
+    EXPECT_EQ(player.answersTo(sent), unanswered);
+    harness.platform.workQueues.runAll();
+    EXPECT_THAT(listedBeforeTheNextAnswer(),
+                testing::ElementsAre(
+                    "sessions for client 1001 :", "sessions for client 1002 :", "active reporting sessions 1 :"));
+    EXPECT_EQ(player.answersTo(sent), answeredOnce(delivered));
+}
+
 TEST_F(ListAllowanceTest, CoversTheReporterIDsOfAMessage)
 {
     const Array unknown(std::vector<foundation::Value>(9'000, foundation::Value(987'654)));
