@@ -82,7 +82,7 @@ public:
 
     // Calls `visit(entry)` with so many entries behind the place. Returns the place of the last, or nothing if there
     // are no more.
-    template <typename Visit> std::optional<Place> visitBehind(Place place, std::size_t most, Visit visit) const
+    template <typename Visit> std::optional<Place> visitBehind(Place place, std::size_t most, const Visit& visit) const
     {
         auto next = firstBehind(place);
         for (std::size_t count = 0; count < most && next != entries_.end(); ++next)
