@@ -257,7 +257,7 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
             return reply(turn, std::nullopt, true);
         const auto session = self.findReportingSessionForID(reporterID, false);
         const auto delegate = self.delegate_.lock();
-        const Finish finish = [reporterID, reply](platform::Turn& last) {
+        const auto finish = [reporterID, reply](platform::Turn& last) {
             KESTO_LOG(KestoReportingClientCategory(), Default, "stopping {}", reporterID);
             reply(last, std::nullopt, true);
         };
@@ -277,13 +277,13 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
     });
 }
 
-void KestoReportingClientServerInstance::completeStop(platform::Turn& turn, const Session& session,
-                                                      const Finish& finish)
+template <typename Finish>
+void KestoReportingClientServerInstance::completeStop(platform::Turn& turn, const Session& session, Finish finish)
 {
     if (const auto& complete = session->transactionCompleteBlock())
         complete(turn, std::nullopt, true);
     session->setTransactionCompleteBlock(nullptr);
-    logActiveSessions(turn, finish);
+    logActiveSessions(turn, std::move(finish));
 }
 
 void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID, SuccessReply reply)
@@ -420,15 +420,17 @@ void KestoReportingClientServerInstance::leave(platform::Turn& turn)
     });
 }
 
-void KestoReportingClientServerInstance::logActiveSessions(platform::Turn& turn, const Finish& finish)
+template <typename Finish>
+void KestoReportingClientServerInstance::logActiveSessions(platform::Turn& turn, Finish finish)
 {
     const auto delegate = delegate_.lock();
     if (!delegate)
         return finish(turn);
-    walkActiveSessions(turn, *delegate, [finish](auto& self, platform::Turn& last, const auto& walk) {
-        if (const auto service = self.delegate_.lock())
-            KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
-                      service->activeSessionCount(), walk->describe(self.listAllowance_));
-        finish(last);
-    });
+    walkActiveSessions(turn, *delegate,
+                       [finish = std::move(finish)](auto& self, platform::Turn& last, const auto& walk) {
+                           if (const auto service = self.delegate_.lock())
+                               KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
+                                         service->activeSessionCount(), walk->describe(self.listAllowance_));
+                           finish(last);
+                       });
 }

@@ -15,7 +15,6 @@
 
 #include <atomic>
 #include <cstdint>
-#include <functional>
 #include <memory>
 #include <optional>
 #include <string>
@@ -92,7 +91,6 @@ private:
         std::uint64_t source; // the connection that it came over
     };
     using Session = std::shared_ptr<KestoReportingSession>;
-    using Finish = std::function<void(platform::Turn& turn)>;
     // A message on its way, and how far it has come.
     struct Delivery {
         Message message;
@@ -182,7 +180,7 @@ private:
     }
     void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
                const session::DriverMoment& moment, const SuccessReply& reply);
-    void completeStop(platform::Turn& turn, const Session& session, const Finish& finish);
+    template <typename Finish> void completeStop(platform::Turn& turn, const Session& session, Finish finish);
     void stopAll(platform::Turn& turn);
     void leave(platform::Turn& turn);
     void collectReporters(platform::Turn& turn, const ReportersReply& reply, client::LongCalls::Place place);
@@ -204,7 +202,7 @@ private:
                                const Message& message, const Session& session);
     static void deliverToSession(platform::Turn& turn, const Message& message, const Session& session);
     [[nodiscard]] ledger::Culprit culprit() const;
-    void logActiveSessions(platform::Turn& turn, const Finish& finish);
+    template <typename Finish> void logActiveSessions(platform::Turn& turn, Finish finish);
     void addSession(platform::Turn& turn, std::int64_t reporterID, const Session& session);
     void removeSession(platform::Turn& turn, std::int64_t reporterID);
 
