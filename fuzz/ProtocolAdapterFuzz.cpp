@@ -58,7 +58,7 @@ public:
     {
         answer(valid, Dictionary{{"reporterID", reporterID}, {"serviceType", AudioServiceTypeUnknown}});
     }
-    void getAllReporters(ArrayReply reply) override { answer(reply, Array{1, -1}); }
+    void getAllReporters(ReportersReply reply) override { answer(reply, ReporterIDs{1, -1}); }
     void killService(SuccessReply) override
     {
         ++calls;

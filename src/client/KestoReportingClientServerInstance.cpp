@@ -245,7 +245,7 @@ void KestoReportingClientServerInstance::start(platform::Turn& turn, KestoReport
         session->sendMessage(turn.tally, features, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
     if (session->mayBeTraced())
         reply(turn, std::nullopt, true);
-    logActiveSessions(delegate);
+    logActiveSessions(turn, [](auto&) { });
 }
 
 void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply)
@@ -271,20 +271,19 @@ void KestoReportingClientServerInstance::stopReportingSessionForID(std::int64_t 
                                   service->sendDriverLogsForSession(later, session, moment);
                                   session->setDriverSnapShot(std::nullopt);
                                   client.stopAndThen(later, session, [session, finish](auto& me, platform::Turn& last) {
-                                      me.completeStop(last, session);
-                                      finish(last);
+                                      me.completeStop(last, session, finish);
                                   });
                               });
     });
 }
 
-void KestoReportingClientServerInstance::completeStop(platform::Turn& turn, const Session& session)
+template <typename Finish>
+void KestoReportingClientServerInstance::completeStop(platform::Turn& turn, const Session& session, Finish finish)
 {
     if (const auto& complete = session->transactionCompleteBlock())
         complete(turn, std::nullopt, true);
     session->setTransactionCompleteBlock(nullptr);
-    if (const auto delegate = delegate_.lock())
-        logActiveSessions(*delegate);
+    logActiveSessions(turn, std::move(finish));
 }
 
 void KestoReportingClientServerInstance::destroyReportingSession(std::int64_t reporterID, SuccessReply reply)
@@ -320,7 +319,7 @@ void KestoReportingClientServerInstance::reporterID(std::int64_t reporterID, Dic
     });
 }
 
-void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
+void KestoReportingClientServerInstance::getAllReporters(ReportersReply reply)
 {
     submitLong([reply = std::move(reply)](auto& self, platform::Turn& turn) {
         self.whenAlone(turn, [reply](auto& client, platform::Turn& later, auto place) {
@@ -329,30 +328,25 @@ void KestoReportingClientServerInstance::getAllReporters(ArrayReply reply)
     });
 }
 
-void KestoReportingClientServerInstance::collectReporters(platform::Turn& turn, const ArrayReply& reply,
+void KestoReportingClientServerInstance::collectReporters(platform::Turn& turn, const ReportersReply& reply,
                                                           client::LongCalls::Place place)
 {
     if (isConnectionLost_) // the calls that it left waiting must not delay others
         return;
     struct Collected {
         client::LongCalls::Place place;
-        KestoReportingServiceDelegateProtocol::Clients clients;
-        std::size_t next = 0;
-        std::vector<foundation::Value> reporterIDs = {};
+        client::SessionWalk sessions;
+        ReporterIDs reporterIDs = {};
     };
     const auto delegate = delegate_.lock();
-    const auto all = std::make_shared<Collected>(std::move(place),
-                                                 delegate ? delegate->getAllClients() : decltype(Collected::clients)());
+    const auto all = std::make_shared<Collected>(
+        std::move(place), client::SessionWalk(delegate ? delegate->getAllClients() : client::SessionWalk::Clients()));
     const auto collectNext = [all](auto&, platform::Turn&) {
-        if (all->next == all->clients.size())
-            return false;
-        for (const auto& entry : all->clients[all->next++]->clientReportingSessionMap())
-            all->reporterIDs.emplace_back(entry.reporterID);
-        return true;
+        return all->sessions.visitNext([&](const auto& entry) { all->reporterIDs.push_back(entry.reporterID); });
     };
     inSlices(turn, collectNext, [all, reply](auto& self, platform::Turn& last) {
         if (!self.isConnectionLost_)
-            reply(last, std::nullopt, std::move(all->reporterIDs));
+            reply(last, std::nullopt, all->reporterIDs);
     });
 }
 
@@ -375,45 +369,45 @@ void KestoReportingClientServerInstance::handleConnectionError()
         const auto delegate = self.delegate_.lock();
         if (!delegate || !isRegistered(*delegate, self))
             return;
-        const auto started = std::make_shared<std::vector<Session>>();
-        for (const auto& entry : self.clientReportingSessionMap_) {
-            entry.session->announcePlayingEnd(turn, platform::PlayingEnding::Vanished);
-            if (entry.session->started())
-                started->push_back(entry.session);
-        }
-        std::ranges::reverse(*started);
-        self.stopAll(turn, started);
+        const auto announceNext = [sessions = client::SessionWalk({self.shared_from_this()})](auto&,
+                                                                                              auto& now) mutable {
+            return sessions.visitNext(
+                [&](const auto& entry) { entry.session->announcePlayingEnd(now, platform::PlayingEnding::Vanished); });
+        };
+        self.inSlices(turn, announceNext, [](auto& me, platform::Turn& later) { me.stopAll(later); });
     });
 }
 
-// From the last to the first. A long session is set aside; many short ones take long, too.
-void KestoReportingClientServerInstance::stopAll(platform::Turn& turn,
-                                                 const std::shared_ptr<std::vector<Session>>& sessions)
+// In the order of the map. A long session is set aside; many short ones take long, too.
+void KestoReportingClientServerInstance::stopAll(platform::Turn& turn)
 {
-    const auto stopShort = [sessions](auto&, platform::Turn& now) {
-        if (sessions->empty() || sessions->back()->takesLongToStop())
+    const auto first = [](auto& self) {
+        client::SessionMap::Place place = 0;
+        return self.clientReportingSessionMap_.startedBehind(place);
+    };
+    const auto stopShort = [first](auto& self, platform::Turn& now) {
+        const auto session = first(self);
+        if (session == nullptr || session->takesLongToStop())
             return false;
-        sessions->back()->stop(now);
-        sessions->pop_back();
+        session->stop(now);
         return true;
     };
-    inSlices(turn, stopShort, [sessions](auto& self, platform::Turn& now) {
-        if (sessions->empty())
+    inSlices(turn, stopShort, [first](auto& self, platform::Turn& now) {
+        Session session = first(self);
+        if (session == nullptr)
             return self.leave(now);
-        Session session = std::move(sessions->back());
-        sessions->pop_back();
-        self.stopAndThen(now, std::move(session),
-                         [sessions](auto& client, platform::Turn& later) { client.stopAll(later, sessions); });
+        self.stopAndThen(now, std::move(session), [](auto& client, platform::Turn& later) { client.stopAll(later); });
     });
 }
 
 // Removes all sessions, and then the client.
 void KestoReportingClientServerInstance::leave(platform::Turn& turn)
 {
-    const auto removeNext = [](auto& self, platform::Turn& now) {
-        if (self.clientReportingSessionMap_.size() == 0)
+    const auto removeNext = [place = client::SessionMap::Place{0}](auto& self, platform::Turn& now) mutable {
+        const auto session = self.clientReportingSessionMap_.sessionBehind(place);
+        if (session == nullptr)
             return false;
-        self.removeSession(now, self.clientReportingSessionMap_.begin()->reporterID);
+        self.removeSession(now, session->reporterID());
         return true;
     };
     inSlices(turn, removeNext, [](auto& self, platform::Turn& now) {
@@ -426,9 +420,17 @@ void KestoReportingClientServerInstance::leave(platform::Turn& turn)
     });
 }
 
-void KestoReportingClientServerInstance::logActiveSessions(KestoReportingServiceDelegateProtocol& delegate)
+template <typename Finish>
+void KestoReportingClientServerInstance::logActiveSessions(platform::Turn& turn, Finish finish)
 {
-    const auto active = delegate.getAllActiveReportingSessions(listAllowance_);
-    KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
-              delegate.activeSessionCount(), listAllowance_.describe(active));
+    const auto delegate = delegate_.lock();
+    if (!delegate)
+        return finish(turn);
+    walkActiveSessions(turn, *delegate,
+                       [finish = std::move(finish)](auto& self, platform::Turn& last, const auto& walk) {
+                           if (const auto service = self.delegate_.lock())
+                               KESTO_LOG(KestoReportingClientCategory(), Default, "{} active reporting session(s) {}",
+                                         service->activeSessionCount(), walk->describe(self.listAllowance_));
+                           finish(last);
+                       });
 }

@@ -72,7 +72,7 @@ public:
     void stopReportingSessionForID(std::int64_t reporterID, SuccessReply reply) override;
     void destroyReportingSession(std::int64_t reporterID, SuccessReply reply) override;
     void reporterID(std::int64_t reporterID, DictionaryReply valid) override;
-    void getAllReporters(ArrayReply reply) override;
+    void getAllReporters(ReportersReply reply) override;
     [[noreturn]] void killService(SuccessReply reply) override;
 
     // Call this when the connection breaks or ends: it stops and drops all sessions and leaves the registry. A second
@@ -96,9 +96,9 @@ private:
         Message message;
         std::optional<ReporterIDs> reporterIDs;
         utility::Reply reply;
-        std::vector<std::weak_ptr<KestoReportingSession>> sessions = {}; // without a list: those that were started
-        std::size_t next = 0; // in the one list or the other
-        std::size_t room = 0; // for further receivers of the IDs
+        std::size_t next = 0; // in the list
+        std::shared_ptr<client::ActiveSessions> sessions = nullptr; // without a list
+        std::size_t room = 0; // for further receivers
         std::size_t refused = 0;
         client::LongCalls::Place place = nullptr; // if it takes long
 
@@ -146,18 +146,23 @@ private:
                          work(*self, later, std::move(place));
                      });
     }
-    // Calls `step(*this, turn)` until it returns false, and then `then(*this, turn)`. If this takes long, other
-    // clients' calls run in between; this client's next calls wait. For an item of `submitLong`, as its last step.
+    // `utility::inSlices` with `step(*this, turn)` and `then(*this, turn)`.
     template <typename Step, typename Then> void inSlices(platform::Turn& turn, Step step, Then then)
     {
-        const utility::Slice slice;
-        while (step(*this, turn))
-            if (slice.isOver())
-                return queue_->pause()([self = shared_from_this(), step = std::move(step),
-                                        then = std::move(then)](platform::Turn& next) mutable {
-                    self->inSlices(next, std::move(step), std::move(then));
-                });
-        then(*this, turn);
+        const auto self = shared_from_this();
+        utility::inSlices(
+            queue_, turn, [self, step = std::move(step)](platform::Turn& now) mutable { return step(*self, now); },
+            [self, then = std::move(then)](platform::Turn& last) mutable { then(*self, last); });
+    }
+    // Logs the sessions of all clients, in slices, and calls `work(*this, turn, walk)` with the walk over those that
+    // are started then. For an item of `submitLong`, as its last step.
+    template <typename Work>
+    void walkActiveSessions(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Work work)
+    {
+        const auto walk = std::make_shared<client::ActiveSessions>(delegate.getAllActiveReportingSessions());
+        inSlices(
+            turn, [walk](auto& self, platform::Turn&) { return walk->logNextClient(self.listAllowance_); },
+            [walk, work = std::move(work)](auto& self, platform::Turn& last) mutable { work(self, last, walk); });
     }
     // Stops the session and then calls `then(*this, turn)`: at once, or, if the session is long, later, and this
     // client's next calls wait for it. For an item of `submitLong`, as its last step.
@@ -165,7 +170,7 @@ private:
     {
         const auto delegate = delegate_.lock();
         if (const auto ends = delegate ? delegate->sessionEnds() : nullptr)
-            return ends->stop(turn, std::move(session), queue_,
+            return ends->stop(turn, std::move(session), userIdentifier_, queue_,
                               [self = shared_from_this(), then = std::move(then)](platform::Turn& later) mutable {
                                   then(*self, later);
                               });
@@ -175,18 +180,19 @@ private:
     }
     void start(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, const Session& session,
                const session::DriverMoment& moment, const SuccessReply& reply);
-    void completeStop(platform::Turn& turn, const Session& session);
-    void stopAll(platform::Turn& turn, const std::shared_ptr<std::vector<Session>>& sessions);
+    template <typename Finish> void completeStop(platform::Turn& turn, const Session& session, Finish finish);
+    void stopAll(platform::Turn& turn);
     void leave(platform::Turn& turn);
-    void collectReporters(platform::Turn& turn, const ArrayReply& reply, client::LongCalls::Place place);
+    void collectReporters(platform::Turn& turn, const ReportersReply& reply, client::LongCalls::Place place);
     void deliver(platform::Turn& turn, Delivery delivery);
-    void beginDelivery(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery);
+    void deliverInSlices(platform::Turn& turn, const std::shared_ptr<Delivery>& delivery);
+    void deliverToActiveSessions(platform::Turn& turn, const std::shared_ptr<Delivery>& delivery);
     bool deliverToNext(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery);
     void finishDelivery(platform::Turn& turn, const Delivery& delivery);
     void deliverToReporter(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate, Delivery& delivery,
                            std::int64_t reporterID);
-    static void deliverToActiveSession(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
-                                       const Message& message, const Session& session);
+    static bool deliverToNextActiveSession(platform::Turn& turn, KestoReportingServiceDelegateProtocol& delegate,
+                                           Delivery& delivery);
     [[nodiscard]] static std::size_t mostReceivers(const Message& message, std::size_t wanted);
     void countRefusedSession(ledger::Tally& tally);
     void countRefusedReceivers(ledger::Tally& tally, const Message& message, std::size_t receivers);
@@ -196,7 +202,7 @@ private:
                                const Message& message, const Session& session);
     static void deliverToSession(platform::Turn& turn, const Message& message, const Session& session);
     [[nodiscard]] ledger::Culprit culprit() const;
-    void logActiveSessions(KestoReportingServiceDelegateProtocol& delegate);
+    template <typename Finish> void logActiveSessions(platform::Turn& turn, Finish finish);
     void addSession(platform::Turn& turn, std::int64_t reporterID, const Session& session);
     void removeSession(platform::Turn& turn, std::int64_t reporterID);
 

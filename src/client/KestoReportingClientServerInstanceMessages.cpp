@@ -14,7 +14,6 @@
 #include "utility/ServiceTraceCodes.h"
 
 #include <algorithm>
-#include <span>
 
 void KestoReportingClientServerInstance::sendMessage(foundation::Dictionary message, AudioEventCategory category,
                                                      std::uint16_t type, std::optional<ReporterIDs> reporterIDs,
@@ -57,38 +56,43 @@ void KestoReportingClientServerInstance::deliver(platform::Turn& turn, Delivery 
         return delivery.reply(turn, std::nullopt);
     if (!delegate->isReportingEnabled())
         return delivery.reply(turn, utility::reportingDisabled);
-    beginDelivery(turn, *delegate, delivery);
-    if (!delivery.mayTakeLong()) {
+    if (delivery.reporterIDs) {
+        delivery.room = mostReceivers(delivery.message, delivery.reporterIDs->size());
+        if (delivery.mayTakeLong())
+            return deliverInSlices(turn, std::make_shared<Delivery>(std::move(delivery)));
         while (deliverToNext(turn, *delegate, delivery)) { }
         return finishDelivery(turn, delivery);
     }
-    const auto shared = std::make_shared<Delivery>(std::move(delivery));
-    inSlices(
-        turn,
-        [shared](auto& self, platform::Turn& now) {
-            const auto service = self.delegate_.lock();
-            return service && self.deliverToNext(now, *service, *shared);
-        },
-        [shared](auto& self, platform::Turn& now) { self.finishDelivery(now, *shared); });
+    walkActiveSessions(turn, *delegate,
+                       [shared = std::make_shared<Delivery>(std::move(delivery))](auto& self, auto& later, auto walk) {
+                           shared->sessions = std::move(walk);
+                           self.deliverToActiveSessions(later, shared);
+                       });
 }
 
-void KestoReportingClientServerInstance::beginDelivery(platform::Turn& turn,
-                                                       KestoReportingServiceDelegateProtocol& delegate,
-                                                       Delivery& delivery)
+void KestoReportingClientServerInstance::deliverInSlices(platform::Turn& turn,
+                                                         const std::shared_ptr<Delivery>& delivery)
 {
-    if (delivery.reporterIDs) {
-        delivery.room = mostReceivers(delivery.message, delivery.reporterIDs->size());
-        return;
-    }
-    const auto active = delegate.getAllActiveReportingSessions(listAllowance_);
-    KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active.size(),
-              listAllowance_.describe(active));
-    if (active.empty())
-        return deliverStandalone(turn, delegate, delivery.message);
-    const std::size_t receivers = std::min(active.size(), mostReceivers(delivery.message, active.size()));
-    countRefusedReceivers(turn.tally, delivery.message, active.size() - receivers);
-    const auto receiving = std::span(active).first(receivers);
-    delivery.sessions.assign(receiving.begin(), receiving.end());
+    inSlices(
+        turn,
+        [delivery](auto& self, platform::Turn& now) {
+            const auto service = self.delegate_.lock();
+            return service && self.deliverToNext(now, *service, *delivery);
+        },
+        [delivery](auto& self, platform::Turn& now) { self.finishDelivery(now, *delivery); });
+}
+
+void KestoReportingClientServerInstance::deliverToActiveSessions(platform::Turn& turn,
+                                                                 const std::shared_ptr<Delivery>& delivery)
+{
+    const std::size_t active = delivery->sessions->count();
+    KESTO_LOG(KestoReportingClientCategory(), Default, "active reporting sessions {} : {}", active,
+              delivery->sessions->describe(listAllowance_));
+    if (const auto delegate = active == 0 ? delegate_.lock() : nullptr)
+        deliverStandalone(turn, *delegate, delivery->message);
+    delivery->room = std::min(active, mostReceivers(delivery->message, active));
+    delivery->refused = active - delivery->room;
+    deliverInSlices(turn, delivery);
 }
 
 // False if none is left.
@@ -96,16 +100,11 @@ bool KestoReportingClientServerInstance::deliverToNext(platform::Turn& turn,
                                                        KestoReportingServiceDelegateProtocol& delegate,
                                                        Delivery& delivery)
 {
-    const std::size_t next = delivery.next++;
-    if (delivery.reporterIDs) {
-        if (next == delivery.reporterIDs->size())
-            return false;
-        deliverToReporter(turn, delegate, delivery, (*delivery.reporterIDs)[next]);
-    } else {
-        if (next == delivery.sessions.size())
-            return false;
-        deliverToActiveSession(turn, delegate, delivery.message, delivery.sessions[next].lock());
-    }
+    if (!delivery.reporterIDs)
+        return deliverToNextActiveSession(turn, delegate, delivery);
+    if (delivery.next == delivery.reporterIDs->size())
+        return false;
+    deliverToReporter(turn, delegate, delivery, (*delivery.reporterIDs)[delivery.next++]);
     return true;
 }
 
@@ -131,18 +130,21 @@ void KestoReportingClientServerInstance::deliverToReporter(platform::Turn& turn,
     deliverToSession(turn, delivery.message, session);
 }
 
-// The session was started when the delivery began. If it has ended since, it does not get the message.
-void KestoReportingClientServerInstance::deliverToActiveSession(platform::Turn& turn,
-                                                                KestoReportingServiceDelegateProtocol& delegate,
-                                                                const Message& message, const Session& session)
+// A session that has ended since the delivery began does not get the message.
+bool KestoReportingClientServerInstance::deliverToNextActiveSession(platform::Turn& turn,
+                                                                    KestoReportingServiceDelegateProtocol& delegate,
+                                                                    Delivery& delivery)
 {
-    if (!session || !session->started()) {
-        turn.tally.add(ledger::Counter::Deliveries);
-        turn.tally.add(ledger::Counter::Inert);
-        return;
+    const auto session = delivery.room == 0 ? nullptr : delivery.sessions->next();
+    if (!session) {
+        turn.tally.add(ledger::Counter::Deliveries, delivery.room);
+        turn.tally.add(ledger::Counter::Inert, delivery.room);
+        return false;
     }
-    deliverToSession(turn, message, session);
-    deliverToSinks(turn, delegate, message, session);
+    --delivery.room;
+    deliverToSession(turn, delivery.message, session);
+    deliverToSinks(turn, delegate, delivery.message, session);
+    return true;
 }
 
 // Without this limit, a message of a million bytes to ten thousand sessions would delay all clients for a minute.

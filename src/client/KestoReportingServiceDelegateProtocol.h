@@ -1,7 +1,7 @@
 // What a client object may ask of the one service object.
 #pragma once
 
-#include "client/ListAllowance.h"
+#include "client/ActiveSessions.h"
 #include "client/LongCalls.h"
 #include "client/SessionEnds.h"
 #include "foundation/values/Value.h"
@@ -19,8 +19,7 @@ class KestoReportingClientServerInstance;
 // On the server queue, unless a comment says otherwise.
 class KestoReportingServiceDelegateProtocol {
 public:
-    using Clients = std::vector<std::shared_ptr<KestoReportingClientServerInstance>>;
-    using Sessions = std::vector<std::shared_ptr<KestoReportingSession>>;
+    using Clients = client::ActiveSessions::Clients;
 
     virtual ~KestoReportingServiceDelegateProtocol() = default;
 
@@ -31,9 +30,8 @@ public:
     // The connected clients in the order of registration: the registry itself, not a copy.
     [[nodiscard]] virtual const Clients& getAllClients() const = 0;
     [[nodiscard]] virtual bool isReportingEnabled() const = 0;
-    // The started sessions of all clients, in the order of registration and then of creation. Logs those of each client
-    // as far as the caller's allowance lasts.
-    [[nodiscard]] virtual Sessions getAllActiveReportingSessions(client::ListAllowance& allowance) = 0;
+    // The started sessions of all clients.
+    [[nodiscard]] virtual client::ActiveSessions getAllActiveReportingSessions() = 0;
     // The session of that ID that belongs to the client registered first, or null.
     [[nodiscard]] virtual std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) = 0;
     // Whether the next two need the drivers' channels, which `readDriverMoment` reads on another thread and gives to

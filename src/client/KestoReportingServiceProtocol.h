@@ -19,8 +19,8 @@ public:
     using SuccessReply = utility::ResultReply<bool>;
     using ServiceTypeReply = utility::ResultReply<AudioServiceType>;
     using DictionaryReply = utility::ResultReply<const foundation::Dictionary&>;
-    using ArrayReply = utility::ResultReply<const foundation::Array&>;
     using ReporterIDs = std::vector<std::int64_t>;
+    using ReportersReply = utility::ResultReply<const ReporterIDs&>;
 
     virtual ~KestoReportingServiceProtocol() = default;
 
@@ -40,7 +40,7 @@ public:
     virtual void destroyReportingSession(std::int64_t reporterID, SuccessReply reply) = 0;
     // Answers {"reporterID", "serviceType"}; they are 0 and 65535 without such a session.
     virtual void reporterID(std::int64_t reporterID, DictionaryReply valid) = 0;
-    virtual void getAllReporters(ArrayReply reply) = 0;
+    virtual void getAllReporters(ReportersReply reply) = 0;
     // Ends the process with exit status 2; the reply is never called.
     virtual void killService(SuccessReply reply) = 0;
 };

@@ -48,9 +48,9 @@ template <typename Describe> std::string ListAllowance::use(std::size_t sessions
     return description;
 }
 
-std::string ListAllowance::describe(std::span<const std::shared_ptr<KestoReportingSession>> sessions)
+std::string ListAllowance::describe(std::size_t count, const NextSession& next)
 {
-    return use(sessions.size(), [&] { return descriptionOfSessions(sessions); });
+    return use(count, [&] { return descriptionOfSessions(count, next); });
 }
 
 std::string ListAllowance::describe(std::span<const std::int64_t> reporterIDs)
@@ -58,17 +58,17 @@ std::string ListAllowance::describe(std::span<const std::int64_t> reporterIDs)
     return use(reporterIDs.size(), [&] { return foundation::format("[{}]", foundation::join(reporterIDs, ",")); });
 }
 
-std::string descriptionOfSessions(std::span<const std::shared_ptr<KestoReportingSession>> sessions)
+std::string descriptionOfSessions(std::size_t count, const NextSession& next)
 {
     constexpr std::size_t longest = std::size_t{24} << 10; // roughly what one log line shows
     std::vector<foundation::Value> descriptions;
     std::size_t length = 0;
-    for (const auto& session : sessions) {
+    while (descriptions.size() != count) {
         if (length > longest) {
-            descriptions.emplace_back(foundation::format("... {} more", sessions.size() - descriptions.size()));
+            descriptions.emplace_back(foundation::format("... {} more", count - descriptions.size()));
             break;
         }
-        const std::string description = session->description();
+        const std::string description = next()->description();
         length += description.size();
         descriptions.emplace_back(description);
     }

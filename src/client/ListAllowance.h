@@ -9,6 +9,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <functional>
 #include <memory>
 #include <span>
 #include <string>
@@ -29,6 +30,9 @@ private:
     double minuteBegan_ = 0; // by the system's uptime
 };
 
+// Gives one session after the other, each once.
+using NextSession = std::function<std::shared_ptr<KestoReportingSession>()>;
+
 // Only on the server queue.
 class ListAllowance {
 public:
@@ -37,7 +41,7 @@ public:
     static constexpr std::size_t mostBytesAMinuteOfAllClients = std::size_t{1} << 20;
 
     // The sessions' descriptions, as many as one log line shows; or, without allowance, "12 sessions".
-    [[nodiscard]] std::string describe(std::span<const std::shared_ptr<KestoReportingSession>> sessions);
+    [[nodiscard]] std::string describe(std::size_t count, const NextSession& next);
     // The same of reporter IDs, all of them.
     [[nodiscard]] std::string describe(std::span<const std::int64_t> reporterIDs);
 
@@ -48,6 +52,6 @@ private:
 };
 
 // The sessions' descriptions as one text for the log; further ones are left out when a log line is full.
-[[nodiscard]] std::string descriptionOfSessions(std::span<const std::shared_ptr<KestoReportingSession>> sessions);
+[[nodiscard]] std::string descriptionOfSessions(std::size_t count, const NextSession& next);
 
 } // namespace client

@@ -1,7 +1,7 @@
 // Calls that reach very many sessions: of each user one at a time.
 //
-// Such a call goes on in slices, so that others run in between, and remembers meanwhile which sessions it has yet to
-// reach. Without this, every connection of a user could make the service remember all of its sessions once more.
+// Such a call goes on in slices, so that others run in between, and keeps meanwhile what it has gathered: a message, or
+// the IDs of all sessions. Without this, every connection of a user could make the service keep that once more.
 #pragma once
 
 #include "platform/WorkQueue.h"

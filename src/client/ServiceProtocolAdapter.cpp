@@ -39,11 +39,20 @@ public:
             foundation::appendCbor(Value(Array{Value(error->domain), Value(error->code)}), frame);
         else
             foundation::appendCborNull(frame);
-        (foundation::appendCbor(Value(values), frame), ...);
+        (append(values, frame), ...);
         caller_->send(turn, std::move(frame));
     }
 
 private:
+    template <typename Result> static void append(const Result& value, std::string& frame)
+    {
+        foundation::appendCbor(Value(value), frame);
+    }
+    static void append(const KestoReportingServiceProtocol::ReporterIDs& reporterIDs, std::string& frame)
+    {
+        foundation::appendCborArray(reporterIDs, frame); // there may be a hundred thousand
+    }
+
     std::shared_ptr<Connection> caller_;
     std::uint64_t call_;
 };
@@ -198,7 +207,7 @@ template <typename Reply> constexpr bool brings(OperationResult result)
     case OperationResult::Success: return std::is_same_v<Reply, Protocol::SuccessReply>;
     case OperationResult::ServiceType: return std::is_same_v<Reply, Protocol::ServiceTypeReply>;
     case OperationResult::Validity: return std::is_same_v<Reply, Protocol::DictionaryReply>;
-    case OperationResult::ReporterIDs: return std::is_same_v<Reply, Protocol::ArrayReply>;
+    case OperationResult::ReporterIDs: return std::is_same_v<Reply, Protocol::ReportersReply>;
     }
     return false;
 }

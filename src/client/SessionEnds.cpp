@@ -3,7 +3,7 @@
 #include "client/SessionEnds.h"
 
 #include "platform/Platform.h"
-#include "utility/LogCategories.h"
+#include "utility/KestoReportingUtility.h"
 #include "utility/ServerQueue.h"
 #include "utility/Slice.h"
 
@@ -12,7 +12,7 @@
 
 namespace client {
 
-void SessionEnds::stop(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session,
+void SessionEnds::stop(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session, std::uint32_t user,
                        const std::shared_ptr<platform::Lane>& lane, Then then)
 {
     utility::assertServerQueue();
@@ -22,98 +22,128 @@ void SessionEnds::stop(platform::Turn& turn, std::shared_ptr<KestoReportingSessi
         session.reset(); // `then` may be what lets go of it
         return then(turn);
     }
-    if (!session->hasManyMessages())
-        return writeFile(turn, std::move(session), lane, std::move(then));
+    const bool isLong = session->hasManyMessages();
     auto run = session->beginStop();
-    ends_.push_back({std::move(session), std::move(run), lane, std::move(then), lane->pause()});
-    if (ends_.size() == 1)
-        begin(ends_.front());
+    auto end = std::make_shared<End>(std::move(session), std::move(run), lane, std::move(then));
+    if (!isLong)
+        return endShort(turn, end);
+    end->resume = lane->pause();
+    waiting_[user].push_back(std::move(end));
+    beginNext();
 }
 
-// The file of a short session. Its other steps are quick, so it waits for no end of a long one.
-void SessionEnds::writeFile(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session,
-                            const std::shared_ptr<platform::Lane>& lane, Then then)
+// Only its file and its trace take long, so it waits for no end of a long one.
+void SessionEnds::endShort(platform::Turn& turn, const SharedEnd& end)
 {
-    auto run = session->beginStop();
-    run->makeVolumeEvents();
-    while (run->hasVolumeEvents())
-        run->sendVolumeEvent(turn, session);
-    elsewhere(
-        [run = std::move(run), session = std::move(session), then = std::move(then), resume = lane->pause()]() mutable {
-            run->summarise();
-            run->letGo();
-            resume([run = std::move(run), session = std::move(session),
-                    then = std::move(then)](platform::Turn& last) mutable {
-                session->finishStop(last, *run);
-                session.reset(); // before `then` may let go of it
-                then(last);
-            });
-        });
-}
-
-void SessionEnds::begin(End& end)
-{
-    elsewhere([self = shared_from_this(), &end] {
-        end.run->makeVolumeEvents();
-        if (!end.run->hasVolumeEvents())
-            return self->summarise(end);
-        resume(end, [self, &end](platform::Turn& turn) { self->sendVolumeEvents(turn, end); });
+    end->run->makeVolumeEvents();
+    while (end->run->hasVolumeEvents())
+        end->run->sendVolumeEvent(turn, end->session);
+    const auto summarise = [end] {
+        end->run->summarise();
+        end->run->letGo();
+    };
+    if (!KestoReportingUtilityIsInternalBuild()) {
+        summarise();
+        return stopTrace(turn, end);
+    }
+    end->resume = end->lane->pause();
+    on(ends_, [self = shared_from_this(), end, summarise] {
+        summarise();
+        resume(*end, [self, end](platform::Turn& next) { self->stopTrace(next, end); });
     });
 }
 
-void SessionEnds::sendVolumeEvents(platform::Turn& turn, End& end)
+// The users in the order of their numbers, each with the end that has waited longest.
+void SessionEnds::beginNext()
 {
-    const utility::Slice slice;
-    do
-        end.run->sendVolumeEvent(turn, end.session);
-    while (end.run->hasVolumeEvents() && !slice.isOver());
-    end.resume = end.lane->pause();
-    if (end.run->hasVolumeEvents())
-        resume(end, [self = shared_from_this(), &end](platform::Turn& next) { self->sendVolumeEvents(next, end); });
-    else
-        elsewhere([self = shared_from_this(), &end] { self->summarise(end); });
+    if (current_ != nullptr || waiting_.empty())
+        return;
+    auto next = waiting_.upper_bound(lastUser_);
+    if (next == waiting_.end())
+        next = waiting_.begin();
+    auto& [user, ends] = *next;
+    lastUser_ = user;
+    current_ = std::move(ends.front());
+    ends.pop_front();
+    if (ends.empty())
+        waiting_.erase(next);
+    begin(current_);
+}
+
+void SessionEnds::begin(const SharedEnd& end)
+{
+    on(ends_, [self = shared_from_this(), end] {
+        end->run->makeVolumeEvents();
+        if (!end->run->hasVolumeEvents())
+            return self->summarise(end);
+        resume(*end, [self, end](platform::Turn& turn) { self->sendVolumeEvents(turn, end); });
+    });
+}
+
+void SessionEnds::sendVolumeEvents(platform::Turn& turn, const SharedEnd& end)
+{
+    const auto sendNext = [end](platform::Turn& now) {
+        end->run->sendVolumeEvent(now, end->session);
+        return end->run->hasVolumeEvents();
+    };
+    utility::inSlices(end->lane, turn, sendNext, [self = shared_from_this(), end](platform::Turn&) {
+        end->resume = end->lane->pause();
+        self->on(self->ends_, [self, end] { self->summarise(end); });
+    });
 }
 
 // On the thread.
-void SessionEnds::summarise(End& end)
+void SessionEnds::summarise(const SharedEnd& end)
 {
-    end.run->summarise();
-    end.run->letGo();
-    resume(end, [self = shared_from_this()](platform::Turn& turn) { self->finish(turn); });
+    end->run->summarise();
+    end->run->letGo();
+    resume(*end, [self = shared_from_this(), end](platform::Turn& turn) {
+        self->current_.reset();
+        self->beginNext();
+        self->stopTrace(turn, end);
+    });
 }
 
-// The item may run, and let go of the end, before this returns.
+void SessionEnds::stopTrace(platform::Turn& turn, const SharedEnd& end)
+{
+    if (!end->run->isTraced())
+        return finish(turn, *end);
+    end->resume = end->lane->pause();
+    on(traces_, [end] {
+        end->run->stopTrace();
+        resume(*end, [end](platform::Turn& last) { finish(last, *end); });
+    });
+}
+
+void SessionEnds::finish(platform::Turn& turn, End& end)
+{
+    end.session->finishStop(turn, *end.run);
+    end.run.reset();
+    end.session.reset(); // before `then` may let go of it
+    end.then(turn);
+}
+
+// The item may run before this returns.
 void SessionEnds::resume(End& end, platform::TurnItem item)
 {
     auto resume = std::move(end.resume);
     resume(std::move(item));
 }
 
-void SessionEnds::finish(platform::Turn& turn)
+void SessionEnds::on(Thread& thread, platform::WorkItem work)
 {
-    End& end = ends_.front();
-    end.session->finishStop(turn, *end.run);
-    auto then = std::move(end.then);
-    ends_.pop_front(); // which lets go of the session before `then` may
-    if (!ends_.empty())
-        begin(ends_.front());
-    then(turn);
-}
-
-void SessionEnds::elsewhere(platform::WorkItem work)
-{
-    if (queue_ == nullptr)
-        makeQueue();
-    if (queue_ != nullptr)
-        queue_->submit(std::move(work));
+    if (thread.queue == nullptr)
+        makeQueue(thread);
+    if (thread.queue != nullptr)
+        thread.queue->submit(std::move(work));
     else
         work();
 }
 
-void SessionEnds::makeQueue()
+void SessionEnds::makeQueue(Thread& thread)
 {
     try {
-        queue_ = platform::current().workQueues.makeSerialQueue("com.quarn.kesto.reporting.ends", {});
+        thread.queue = platform::current().workQueues.makeSerialQueue(thread.name, {});
     } catch (const std::system_error& refusal) { // slower calls are better than a service that ends
         if (!std::exchange(isRefused_, true))
             KESTO_LOG(KestoReportingClientCategory(), Error,

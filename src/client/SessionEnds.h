@@ -2,26 +2,31 @@
 //
 // The session itself stops at once, for everyone. Its messages stay behind until the end is over: as long as they take
 // memory, their client pays for it. One end follows the other, so the memory that an end takes by itself is needed only
-// once, however many sessions stop.
+// once, however many sessions stop. The users take turns, so that one end of each other user goes first at most. A
+// trace that stops may wait for the kernel and for a million events; so traces have another thread.
 #pragma once
 
 #include "platform/WorkQueue.h"
 #include "session/KestoReportingSession.h"
 
+#include <cstdint>
 #include <deque>
 #include <functional>
+#include <map>
 #include <memory>
+#include <string_view>
 
 namespace client {
 
-// If the system refuses the thread, ends run on the server queue. Owned by a shared pointer. Server queue.
+// If the system refuses a thread, its work is done on the server queue. Owned by a shared pointer. Server queue.
 class SessionEnds : public std::enable_shared_from_this<SessionEnds> {
 public:
     using Then = std::move_only_function<void(platform::Turn& turn)>;
 
     // Stops the session, if it is started, and then calls `then`: at once if that is quick, and otherwise in a later
-    // item of the lane, which pauses until then. For an item of the lane, submitted by `submitLong`, as its last step.
-    void stop(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session,
+    // item of the lane of that user, which pauses until then. For an item of the lane, submitted by `submitLong`, as
+    // its last step.
+    void stop(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session, std::uint32_t user,
               const std::shared_ptr<platform::Lane>& lane, Then then);
 
 private:
@@ -33,20 +38,30 @@ private:
         Then then;
         platform::Lane::Resume resume;
     };
+    using SharedEnd = std::shared_ptr<End>;
+    // A queue with a thread, made when it is needed first: most services never need one.
+    struct Thread {
+        std::string_view name;
+        std::shared_ptr<platform::WorkQueue> queue = nullptr;
+    };
 
-    void writeFile(platform::Turn& turn, std::shared_ptr<KestoReportingSession> session,
-                   const std::shared_ptr<platform::Lane>& lane, Then then);
-    void begin(End& end);
-    void sendVolumeEvents(platform::Turn& turn, End& end);
-    void summarise(End& end);
-    void finish(platform::Turn& turn);
+    void endShort(platform::Turn& turn, const SharedEnd& end);
+    void beginNext();
+    void begin(const SharedEnd& end);
+    void sendVolumeEvents(platform::Turn& turn, const SharedEnd& end);
+    void summarise(const SharedEnd& end);
+    void stopTrace(platform::Turn& turn, const SharedEnd& end);
+    static void finish(platform::Turn& turn, End& end);
     static void resume(End& end, platform::TurnItem item);
-    void elsewhere(platform::WorkItem work);
-    void makeQueue();
+    void on(Thread& thread, platform::WorkItem work);
+    void makeQueue(Thread& thread);
 
-    std::shared_ptr<platform::WorkQueue> queue_; // null until a long session stops: most services see none
+    Thread ends_{"com.quarn.kesto.reporting.ends"};
+    Thread traces_{"com.quarn.kesto.reporting.traces"};
     bool isRefused_ = false; // the log says so once
-    std::deque<End> ends_; // the first one is on its way, the others wait
+    SharedEnd current_;
+    std::map<std::uint32_t, std::deque<SharedEnd>> waiting_; // by user
+    std::uint32_t lastUser_ = 0; // whose turn it was
 };
 
 } // namespace client

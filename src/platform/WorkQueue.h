@@ -55,6 +55,9 @@ struct Submitter {
     std::int32_t process = 0; // 0 where the kernel does not tell
 };
 
+// The service itself: no user has this number.
+inline constexpr Submitter theService{.user = ~0U, .process = 0};
+
 class Lane;
 
 // A serial queue that works in turns: it runs what waits, but not for long, and then hands what the items gathered to

@@ -108,21 +108,23 @@ void KestoReportingServiceDelegate::reporterIDRemoved(std::int64_t reporterID,
     reporterIndex_.remove(reporterID, client);
 }
 
-KestoReportingServiceDelegateProtocol::Sessions
-KestoReportingServiceDelegate::getAllActiveReportingSessions(client::ListAllowance& allowance)
+client::ActiveSessions KestoReportingServiceDelegate::getAllActiveReportingSessions()
 {
     utility::assertServerQueue();
-    Sessions active;
-    for (const auto& client : getAllClients()) {
-        Sessions sessions;
-        for (const auto& entry : client->clientReportingSessionMap())
-            sessions.push_back(entry.session);
-        KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "sessions for client {} : {}",
-                  client->processIdentifier(), allowance.describe(sessions));
-        std::erase_if(sessions, [](const auto& session) { return !session->started(); });
-        active.insert(active.end(), sessions.begin(), sessions.end());
-    }
-    return active;
+    return {clients_, logSessions};
+}
+
+void KestoReportingServiceDelegate::logSessions(const KestoReportingClientServerInstance& client,
+                                                client::ListAllowance& allowance)
+{
+    const client::SessionMap& sessions = client.clientReportingSessionMap();
+    const auto describe = [&] {
+        return allowance.describe(sessions.size(), [&, place = client::SessionMap::Place{0}]() mutable {
+            return sessions.sessionBehind(place);
+        });
+    };
+    KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "sessions for client {} : {}",
+              client.processIdentifier(), describe());
 }
 
 std::shared_ptr<KestoReportingSession> KestoReportingServiceDelegate::findReportingSessionForID(std::int64_t reporterID)

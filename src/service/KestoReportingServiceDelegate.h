@@ -10,6 +10,7 @@
 #include "platform/Connection.h"
 #include "service/ReporterIndex.h"
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
+#include "utility/ServerQueue.h"
 
 #include <array>
 #include <atomic>
@@ -44,7 +45,7 @@ public:
     [[nodiscard]] std::optional<foundation::Dictionary> getFeaturesState() override;
     [[nodiscard]] const Clients& getAllClients() const override { return clients_; }
     [[nodiscard]] bool isReportingEnabled() const override { return reportingEnabled_; }
-    [[nodiscard]] Sessions getAllActiveReportingSessions(client::ListAllowance& allowance) override;
+    [[nodiscard]] client::ActiveSessions getAllActiveReportingSessions() override;
     [[nodiscard]] std::shared_ptr<KestoReportingSession> findReportingSessionForID(std::int64_t reporterID) override;
     [[nodiscard]] bool needsDriverMoments() const override { return driverUtility_->needsMoments(); }
     void readDriverMoment(std::move_only_function<void(session::DriverMoment moment)> take) override
@@ -85,12 +86,13 @@ private:
 
     KestoReportingServiceDelegate();
     void listenForFeatureStateChanges();
-    void handleFeatureChange(std::int32_t token);
+    void handleFeatureChange(platform::Turn& turn, std::int32_t token);
     [[nodiscard]] Features features() const;
     [[nodiscard]] static std::optional<foundation::Value> valueOf(const Feature& feature);
     [[nodiscard]] static std::string descriptionOf(const Features& features);
     [[nodiscard]] foundation::Value stateForBugCapture() const;
     void registerClient(platform::Turn& turn, const std::shared_ptr<KestoReportingClientServerInstance>& client);
+    static void logSessions(const KestoReportingClientServerInstance& client, client::ListAllowance& allowance);
     static void handleInvalidation(std::int32_t processIdentifier,
                                    const std::shared_ptr<KestoReportingClientServerInstance>& client);
 
@@ -106,6 +108,7 @@ private:
     foundation::Mutex lock_;
     service::ReporterIndex reporterIndex_ KESTO_GUARDED_BY(lock_);
 
+    const std::shared_ptr<platform::Lane> featureChanges_ = utility::serverQueue()->makeLane(platform::theService);
     mutable foundation::Mutex featuresLock_;
     Features features_ KESTO_GUARDED_BY(featuresLock_);
 };

@@ -1,10 +1,12 @@
 // Device-wide settings as messages: the accessory setting of the home screen, the device's name and the ringer
-// switch are sent to a session when it starts, and to all sessions when one of them changes.
+// switch are sent to a session when it starts, and to all sessions when one of them changes. One change follows the
+// other on a lane of their own, so that others go on while a hundred thousand sessions get one.
 #include "client/KestoReportingClientServerInstance.h"
 #include "platform/Platform.h"
 #include "service/KestoReportingServiceDelegate.h"
 #include "utility/KestoReportingUtility.h"
 #include "utility/ServerQueue.h"
+#include "utility/Slice.h"
 
 #include <cmath>
 
@@ -17,7 +19,8 @@ void KestoReportingServiceDelegate::listenForFeatureStateChanges()
         const auto [status, token] = platform::current().notifications.registerNotification(
             table[place].notification, utility::serverQueue(), [service = weak_from_this()](std::int32_t changed) {
                 if (const auto self = service.lock())
-                    self->handleFeatureChange(changed);
+                    self->featureChanges_->submitLong(
+                        [self, changed](platform::Turn& turn) { self->handleFeatureChange(turn, changed); });
             });
         {
             const foundation::Lock lock(featuresLock_);
@@ -62,18 +65,23 @@ std::optional<foundation::Value> KestoReportingServiceDelegate::valueOf(const Fe
     return *state == 1;
 }
 
-void KestoReportingServiceDelegate::handleFeatureChange(std::int32_t token)
+// A session that starts meanwhile has the features from its start, perhaps newer ones.
+void KestoReportingServiceDelegate::handleFeatureChange(platform::Turn& turn, std::int32_t token)
 {
     utility::assertServerQueue();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "feature {} changes", token);
     const auto state = getFeaturesState();
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Info, "defaults {}",
               state ? foundation::Value(*state).text() : "(null)");
-    ledger::Tally tally;
-    for (const auto& client : clients_)
-        for (const auto& entry : client->clientReportingSessionMap())
-            entry.session->sendMessage(tally, state, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
-    platform::current().ledger.post(tally);
+    const auto send = [state, lastRun = KestoReportingSession::lastRunOfAll()](platform::Turn& now,
+                                                                               KestoReportingSession& session) {
+        if (session.lastRun() <= lastRun)
+            session.sendMessage(now.tally, state, AudioEventCategorySetup, AudioEventTypeSetup, nullptr);
+    };
+    const auto sendToNext = [send, sessions = client::SessionWalk(clients_)](platform::Turn& now) mutable {
+        return sessions.visitNext([&](const auto& entry) { send(now, *entry.session); });
+    };
+    utility::inSlices(featureChanges_, turn, sendToNext, [](platform::Turn&) { });
 }
 
 std::string KestoReportingServiceDelegate::descriptionOf(const Features& features)

@@ -14,16 +14,15 @@ foundation::Value KestoReportingServiceDelegate::stateForBugCapture() const
     for (const auto& client : clients_) {
         const std::string processName = client->clientProcessName().value_or(std::string());
         count += client->clientReportingSessionMap().size();
-        for (const auto& [reporterID, session] : client->clientReportingSessionMap()) {
-            if (shown.size() == mostShown)
-                break;
+        client->clientReportingSessionMap().visitBehind(0, mostShown - shown.size(), [&](const auto& entry) {
+            const auto& [reporterID, session] = entry;
             const auto service = KestoReportingUtilityGenerateServiceNameFromServiceType(session->serviceType());
             shown.emplace_back(foundation::Dictionary{{"process", processName},
                                                       {"pid", client->processIdentifier()},
                                                       {"reporterID", reporterID},
                                                       {"service", service},
                                                       {"started", session->started()}});
-        }
+        });
     }
     return foundation::Dictionary{
         {"clients", clients_.size()}, {"sessions", count}, {"shown", foundation::Array(std::move(shown))}};

@@ -15,6 +15,8 @@
 
 namespace {
 
+constinit std::atomic<std::uint64_t> runs{0};
+
 // The part of the application's name that a log line shows: the client chooses the name, and one line lists all
 // sessions.
 std::string applicationText(const foundation::Dictionary& configuration)
@@ -43,6 +45,11 @@ std::size_t roughBytes(const session::DriverSnapShot& snapShot)
 }
 
 } // namespace
+
+std::uint64_t KestoReportingSession::lastRunOfAll() noexcept
+{
+    return runs;
+}
 
 KestoReportingSession::KestoReportingSession(std::int64_t reporterID, std::vector<std::int32_t> processIdentifiers,
                                              std::shared_ptr<session::StorageBudget> budget, ledger::Culprit client)
@@ -190,7 +197,8 @@ void KestoReportingSession::start()
         KESTO_LOG(KestoReportingSessionCategory(), Info, "{} is already started", reporterID_);
         return;
     }
-    started_ = true;
+    lastRun_ = ++runs;
+    setStarted(true);
     {
         const foundation::Lock lock(runLock_);
         run_ = std::make_shared<session::Run>(reporterID_, budget_);
@@ -211,6 +219,7 @@ void KestoReportingSession::stop(platform::Turn& turn)
     while (end->hasVolumeEvents())
         end->sendVolumeEvent(turn, shared_from_this());
     end->summarise();
+    end->stopTrace();
     finishStop(turn, *end);
 }
 
@@ -221,7 +230,7 @@ std::unique_ptr<session::RunEnd> KestoReportingSession::beginStop()
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     auto end = makeRunEnd();
     letGoOfMessages();
-    started_ = false;
+    setStarted(false);
     return end;
 }
 
@@ -230,16 +239,15 @@ void KestoReportingSession::finishStop(platform::Turn& turn, session::RunEnd& en
     utility::assertServerQueue();
     end.addTo(turn.tally);
     turn.tally.add(ledger::Counter::SessionsStopped);
-    stopTracing();
     if (end.messagesLost() != 0)
         KESTO_LOG(KestoReportingSessionCategory(), Error, "session {} lost {} messages for lack of memory", reporterID_,
                   end.messagesLost());
     end.letGo();
     letGoOfMessages();
-    started_ = false;
+    setStarted(false);
 }
 
-std::unique_ptr<session::RunEnd> KestoReportingSession::makeRunEnd() const
+std::unique_ptr<session::RunEnd> KestoReportingSession::makeRunEnd()
 {
     KESTO_LOG(KestoReportingSessionCategory(), Debug, "ending session {}", reporterID_);
     utility::emitTraceCode(utility::ServiceTraceCode::SessionStopping);
@@ -248,13 +256,14 @@ std::unique_ptr<session::RunEnd> KestoReportingSession::makeRunEnd() const
                                                                     .configuration = configuration(),
                                                                     .culprit = culprit(),
                                                                     .budget = budget_},
-                                             run());
+                                             run(), takeRunningTrace());
 }
 
 bool KestoReportingSession::takesLongToStop() const
 {
     const auto run = this->run();
-    return run && !run->store().empty() && (hasManyMessages() || KestoReportingUtilityIsInternalBuild());
+    const bool hasMessages = run && !run->store().empty();
+    return startedTracing_ || (hasMessages && (hasManyMessages() || KestoReportingUtilityIsInternalBuild()));
 }
 
 // What ends sooner than another thread is woken, is not many. Ordinary messages of so many bytes take 0.1 ms, and those
@@ -265,6 +274,12 @@ bool KestoReportingSession::hasManyMessages() const
     constexpr std::size_t fewBytes = std::size_t{48} << 10;
     const auto run = this->run();
     return run && (run->store().size() > fewMessages || run->store().bytes() > fewBytes);
+}
+
+void KestoReportingSession::setStarted(bool started)
+{
+    if (std::exchange(started_, started) != started && startedObserver_)
+        startedObserver_(started);
 }
 
 void KestoReportingSession::letGoOfMessages()

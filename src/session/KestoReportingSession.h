@@ -73,6 +73,15 @@ public:
     static constexpr std::size_t largestConfiguration = std::size_t{1} << 20;
 
     [[nodiscard]] bool started() const { return started_; }
+    // Calls the observer whenever the session starts or is stopped, in place of an earlier one; null: nobody.
+    void observeStarted(std::move_only_function<void(bool started)> observer)
+    {
+        startedObserver_ = std::move(observer);
+    }
+    // The number of the last run that it began; the runs of all sessions count up from 1.
+    [[nodiscard]] std::uint64_t lastRun() const { return lastRun_; }
+    // The number of the last run of all sessions.
+    [[nodiscard]] static std::uint64_t lastRunOfAll() noexcept;
     // Begins a run with an empty store. A session that has started already is not changed.
     void start();
     // Ends the run and drops the recorded messages; the events made of them go with the turn. Has no effect on a
@@ -80,7 +89,7 @@ public:
     void stop(platform::Turn& turn);
     // Whether that would take so long that other clients should not wait for it.
     [[nodiscard]] bool takesLongToStop() const;
-    // Whether that is because of the messages, and not only of the file that is written.
+    // Whether that is because of the messages, and not only of the file that is written, or of a trace.
     [[nodiscard]] bool hasManyMessages() const;
     // The same as a stop, in two parts, for a session that is started. The first takes the run out of the session,
     // which is stopped from then on; the caller carries out the steps of its end, and then calls the second. Nothing
@@ -181,12 +190,15 @@ public:
 
 private:
     [[nodiscard]] std::shared_ptr<session::Run> run() const;
-    [[nodiscard]] std::unique_ptr<session::RunEnd> makeRunEnd() const;
+    [[nodiscard]] std::unique_ptr<session::RunEnd> makeRunEnd();
     void letGoOfMessages();
+    void setStarted(bool started);
     void startTracing();
-    void stopTracing();
+    [[nodiscard]] std::unique_ptr<TraceRunner> takeRunningTrace();
 
     bool started_ = false;
+    std::move_only_function<void(bool started)> startedObserver_;
+    std::uint64_t lastRun_ = 0;
     bool blinReportingEnabled_ = false;
     bool startedTracing_ = false;
     std::atomic<AudioServiceType> serviceType_{0};

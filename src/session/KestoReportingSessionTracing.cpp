@@ -84,13 +84,13 @@ void KestoReportingSession::startTracing()
     traceRunner_->runTraces();
 }
 
-void KestoReportingSession::stopTracing()
+// The trace that the session's stop stops, or null.
+std::unique_ptr<TraceRunner> KestoReportingSession::takeRunningTrace()
 {
     if (!startedTracing_ || !mayBeTraced() || !allowsKernelTrace(configuration()))
-        return;
+        return nullptr;
     startedTracing_ = false;
-    traceRunner_->stopTracingandProcessResults();
-    traceRunner_.reset();
     traceParams_.reset();
     tracingFileName_.reset();
+    return std::move(traceRunner_);
 }

@@ -5,6 +5,7 @@
 #include "platform/Platform.h"
 #include "session/KestoReportingSession.h"
 #include "sinks/KestoReportingFennicBridge.h"
+#include "tracing/TraceRunner.h"
 #include "utility/KestoReportingUtility.h"
 
 #include <optional>
@@ -12,12 +13,15 @@
 
 namespace session {
 
-RunEnd::RunEnd(Facts facts, std::shared_ptr<Run> run)
+RunEnd::RunEnd(Facts facts, std::shared_ptr<Run> run, std::unique_ptr<TraceRunner> trace)
     : facts_(std::move(facts)),
       run_(std::move(run)),
+      trace_(std::move(trace)),
       volumeShare_(facts_.budget)
 {
 }
+
+RunEnd::~RunEnd() = default;
 
 void RunEnd::makeVolumeEvents()
 {
@@ -53,6 +57,12 @@ void RunEnd::summarise()
         send(tally_, *summary, AudioEventCategoryUndefined, AudioEventTypeUnknown);
     }
     messagesLost_ = run_->messagesLost();
+}
+
+void RunEnd::stopTrace()
+{
+    if (const auto trace = std::move(trace_))
+        trace->stopTracingandProcessResults();
 }
 
 void RunEnd::send(ledger::Tally& tally, const foundation::Dictionary& message, AudioEventCategory category,

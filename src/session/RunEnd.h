@@ -1,5 +1,5 @@
 // What a session's stop makes of its run, step by step: the volume events, on internal builds the file, and the summary
-// event; then the messages are let go.
+// event; then the messages are let go, and the trace stops.
 //
 // With a million messages this takes a second, for which no other client should wait. So the end of a run knows what
 // the session was when it stopped, and does not need the session: its long steps may run on a thread of their own. Only
@@ -16,6 +16,8 @@
 #include <memory>
 #include <vector>
 
+class TraceRunner;
+
 namespace session {
 
 // One thread at a time. Call the steps in their order, each once.
@@ -29,7 +31,11 @@ public:
         ledger::Culprit culprit;
         std::shared_ptr<StorageBudget> budget;
     };
-    RunEnd(Facts facts, std::shared_ptr<Run> run);
+    // The trace, if there is one, is running.
+    RunEnd(Facts facts, std::shared_ptr<Run> run, std::unique_ptr<TraceRunner> trace);
+    ~RunEnd();
+    RunEnd(const RunEnd&) = delete;
+    RunEnd& operator=(const RunEnd&) = delete;
 
     // 1. Derives the volume events. Any thread.
     void makeVolumeEvents();
@@ -40,7 +46,10 @@ public:
     void summarise();
     // 4. Lets go of the messages; leave it out where the session still has them. Any thread.
     void letGo() { run_.reset(); }
-    // 5. Adds what the third step counted, and says how many messages of the run were lost for lack of memory.
+    // 5. Stops the trace, waits for its events and writes its results. A thread that may wait.
+    void stopTrace();
+    [[nodiscard]] bool isTraced() const { return trace_ != nullptr; }
+    // 6. Adds what the third step counted, and says how many messages of the run were lost for lack of memory.
     void addTo(ledger::Tally& tally) { tally.takeFrom(tally_); }
     [[nodiscard]] std::uint64_t messagesLost() const { return messagesLost_; }
 
@@ -50,6 +59,7 @@ private:
 
     const Facts facts_;
     std::shared_ptr<Run> run_;
+    std::unique_ptr<TraceRunner> trace_;
     StorageShare volumeShare_;
     std::vector<foundation::Dictionary> volumeEvents_;
     std::size_t nextVolumeEvent_ = 0;

@@ -23,8 +23,8 @@ public:
 
     void addTraceDataToCollect(std::unique_ptr<TraceInterval> interval) { data_.push_back(std::move(interval)); }
     // Lets each measurement, in order, read all events. It stops after this many results, or after this many events
-    // were read by all together (about a second of work, for which the service waits), and logs how many measurements
-    // are left out. The first measurement always runs.
+    // were read by all together (about a second of work), and logs how many measurements are left out. The first
+    // measurement always runs.
     static constexpr std::size_t mostResults = 1'000'000;
     static constexpr std::size_t mostEventsRead = 50'000'000;
     void processTracepoints(const platform::KernelTraceSession& session, std::span<const trace_point> events);

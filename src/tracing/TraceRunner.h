@@ -2,7 +2,8 @@
 // measures them and writes the results to a file.
 //
 // All work on a running trace is done on the runner's own "Tracing Queue". The thread that stops the traces waits until
-// each is complete; so the two never use a trace at the same time, and need no locks.
+// each is complete; so the two never use a trace at the same time, and need no locks. It is not that of the server
+// queue, because a million events take a second.
 #pragma once
 
 #include "platform/PerformanceWriter.h"

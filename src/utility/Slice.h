@@ -5,8 +5,11 @@
 #pragma once
 
 #include "platform/Platform.h"
+#include "platform/WorkQueue.h"
 
 #include <chrono>
+#include <memory>
+#include <utility>
 
 namespace utility {
 
@@ -21,5 +24,19 @@ private:
     [[nodiscard]] static double now() { return platform::current().clock.systemUptime(); }
     const double began_ = now();
 };
+
+// Calls `step(turn)` until it returns false, and then `then(turn)`. If this takes long, items of other lanes run in
+// between; the next ones of this lane wait. For an item of the lane, submitted by `submitLong`, as its last step.
+template <typename Step, typename Then>
+void inSlices(const std::shared_ptr<platform::Lane>& lane, platform::Turn& turn, Step step, Then then)
+{
+    const Slice slice;
+    while (step(turn))
+        if (slice.isOver())
+            return lane->pause()([lane, step = std::move(step), then = std::move(then)](platform::Turn& next) mutable {
+                inSlices(lane, next, std::move(step), std::move(then));
+            });
+    then(turn);
+}
 
 } // namespace utility

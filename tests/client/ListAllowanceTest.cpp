@@ -25,7 +25,7 @@ TEST_F(ListTest, DescribesOneMoreSessionAfterExactly24KibibytesOfDescriptionsAnd
 {
     constexpr std::size_t sessionsOf24Kibibytes = 96;
     constexpr std::size_t bytesOfADescription = 256;
-    KestoReportingServiceDelegateProtocol::Sessions sessions;
+    std::vector<std::shared_ptr<KestoReportingSession>> sessions;
     const auto addSession = [&](std::int64_t reporterID) {
         sessions.push_back(std::make_shared<KestoReportingSession>(reporterID, std::vector<std::int32_t>{1001}));
         sessions.back()->setConfiguration(Dictionary{{"HostApplicationDisplayID", std::string(173, 'x')}});
@@ -33,12 +33,15 @@ TEST_F(ListTest, DescribesOneMoreSessionAfterExactly24KibibytesOfDescriptionsAnd
     };
     for (std::size_t count = 0; count < sessionsOf24Kibibytes; ++count)
         addSession(100);
+    const auto describe = [&] {
+        return client::descriptionOfSessions(sessions.size(), [next = sessions.begin()]() mutable { return *next++; });
+    };
     addSession(201);
-    EXPECT_THAT(client::descriptionOfSessions(sessions), EndsWith("xxx,started=0\"]"));
-    EXPECT_THAT(client::descriptionOfSessions(sessions), HasSubstr("\"reporterID=201,"));
+    EXPECT_THAT(describe(), EndsWith("xxx,started=0\"]"));
+    EXPECT_THAT(describe(), HasSubstr("\"reporterID=201,"));
     addSession(202);
-    EXPECT_THAT(client::descriptionOfSessions(sessions), HasSubstr("\"reporterID=201,"));
-    EXPECT_THAT(client::descriptionOfSessions(sessions), EndsWith("xxx,started=0\",\"... 1 more\"]"));
+    EXPECT_THAT(describe(), HasSubstr("\"reporterID=201,"));
+    EXPECT_THAT(describe(), EndsWith("xxx,started=0\",\"... 1 more\"]"));
 }
 
 // --- the lists of a minute
@@ -133,6 +136,55 @@ TEST_F(ListAllowanceTest, IsSharedByAllClientsSoThatNoneGetsMoreByConnectingAgai
     }
     EXPECT_GT(bytes, allowance);
     EXPECT_LT(bytes, allowance + everythingElse);
+}
+
+// --- many lists
+
+// Each reading of the clock takes longer than a slice of the server queue's time.
+class SlowListsTest : public ListAllowanceTest {
+protected:
+    SlowListsTest()
+    {
+        harness.forget();
+        harness.platform.clock.setPaceOfSystemUptime(0.001);
+    }
+
+    // The lines that list sessions when another client's call is answered.
+    std::vector<std::string> listedBeforeTheNextAnswer()
+    {
+        const auto other = recorder.submit(GetServiceNameForReporterID, {0});
+        while (recorder.answersTo(other) == unanswered)
+            EXPECT_TRUE(harness.platform.workQueues.runOne());
+        std::vector<std::string> lines;
+        for (const LogLine& line : harness.platform.log.lines())
+            if (line.message.contains("essions for client") || line.message.contains("active reporting session"))
+                lines.push_back(line.message.substr(0, line.message.find(" [")));
+        return lines;
+    }
+};
+
+TEST_F(SlowListsTest, LetTheCallsOfOthersGoInBetweenAtAStop)
+{
+    const auto stopped = player.submit(StopReportingSessionForID, {1});
+    EXPECT_THAT(listedBeforeTheNextAnswer(), testing::ElementsAre("sessions for client 1001 :"));
+    EXPECT_EQ(player.answersTo(stopped), unanswered);
+    harness.platform.workQueues.runAll();
+    EXPECT_THAT(listedBeforeTheNextAnswer(),
+                testing::ElementsAre(
+                    "sessions for client 1001 :", "sessions for client 1002 :", "0 active reporting session(s)"));
+    EXPECT_EQ(player.answersTo(stopped), answeredOnce(succeeded));
+}
+
+TEST_F(SlowListsTest, LetTheCallsOfOthersGoInBetweenAtAMessageToAll)
+{
+    const auto sent = player.submit(SendMessage, {Dictionary{{"a", 1}}, 4, 1, null});
+    EXPECT_THAT(listedBeforeTheNextAnswer(), testing::ElementsAre("sessions for client 1001 :"));
+    EXPECT_EQ(player.answersTo(sent), unanswered);
+    harness.platform.workQueues.runAll();
+    EXPECT_THAT(listedBeforeTheNextAnswer(),
+                testing::ElementsAre(
+                    "sessions for client 1001 :", "sessions for client 1002 :", "active reporting sessions 1 :"));
+    EXPECT_EQ(player.answersTo(sent), answeredOnce(delivered));
 }
 
 TEST_F(ListAllowanceTest, CoversTheReporterIDsOfAMessage)

@@ -33,7 +33,7 @@ public:
     MOCK_METHOD(void, stopReportingSessionForID, (std::int64_t, SuccessReply), (override));
     MOCK_METHOD(void, destroyReportingSession, (std::int64_t, SuccessReply), (override));
     MOCK_METHOD(void, reporterID, (std::int64_t, DictionaryReply), (override));
-    MOCK_METHOD(void, getAllReporters, (ArrayReply), (override));
+    MOCK_METHOD(void, getAllReporters, (ReportersReply), (override));
     MOCK_METHOD(void, killService, (SuccessReply), (override));
 };
 
@@ -306,7 +306,9 @@ TEST_F(AdapterTest, AnswersWithTheCallsNumberTheErrorAndTheValues)
     EXPECT_CALL(*protocol, reporterID).WillOnce([&](auto, auto reply) {
         reply(turn, std::nullopt, Dictionary{{"reporterID", 0}, {"serviceType", 65535}});
     });
-    EXPECT_CALL(*protocol, getAllReporters).WillOnce([&](auto reply) { reply(turn, std::nullopt, Array{1, leastID}); });
+    EXPECT_CALL(*protocol, getAllReporters).WillOnce([&](auto reply) {
+        reply(turn, std::nullopt, ReporterIDs{0, 23, 24, 65'536, largestID, -1, -25, leastID});
+    });
     EXPECT_CALL(*protocol, sendMessage).WillOnce([&](auto, auto, auto, auto, auto reply) {
         reply(turn, std::nullopt);
     });
@@ -323,8 +325,8 @@ TEST_F(AdapterTest, AnswersWithTheCallsNumberTheErrorAndTheValues)
     EXPECT_THAT(answers(),
                 ElementsAre(Array{1, null, true}, Array{2, null, false}, Array{3, null, 65535},
                             Array{4, null, Dictionary{{"reporterID", 0}, {"serviceType", 65535}}},
-                            Array{5, null, Array{1, leastID}}, Array{largestCall, null},
-                            Array{7, Array{"com.quarn.audio.reporting", 1}}));
+                            Array{5, null, Array{0, 23, 24, 65'536, largestID, -1, -25, leastID}},
+                            Array{largestCall, null}, Array{7, Array{"com.quarn.audio.reporting", 1}}));
 }
 
 TEST_F(AdapterTest, AnswersBooleansAsBooleansAndNumbersAsIntegers)

@@ -3,6 +3,7 @@
 #include "client/SessionEnds.h"
 #include "support/EmittedCodes.h"
 #include "support/ServiceHarness.h"
+#include "tracing/TraceRunner.h"
 
 #include <algorithm>
 #include <gmock/gmock.h>
@@ -191,6 +192,35 @@ TEST_F(SessionEndsTest, EndsOneSessionAfterTheOther)
     expectTheSumsToHold();
 }
 
+TEST_F(SessionEndsTest, LetsTheUsersTakeTurns)
+{
+    TestClient stranger = harness.connect("stranger", 77);
+    TestClient third = harness.connect("third", 5);
+    for (const std::int64_t reporterID : {41, 42})
+        play(player, reporterID);
+    for (const std::int64_t reporterID : {43, 44})
+        play(recorder, reporterID);
+    play(stranger, 71);
+    play(stranger, 72);
+    play(third, 51);
+    std::vector<std::string> stopped;
+    platform.log.setObserver([&](const LogLine& line) {
+        if (line.level == Default && line.message.starts_with("stopping "))
+            stopped.push_back(line.message.substr(9));
+    });
+    submitStop(player, 41);
+    submitStop(player, 42);
+    submitStop(recorder, 43);
+    submitStop(recorder, 44);
+    submitStop(stranger, 71);
+    submitStop(stranger, 72);
+    submitStop(third, 51);
+    platform.workQueues.runAll();
+    platform.log.setObserver(nullptr);
+    EXPECT_THAT(stopped, ElementsAre("41", "51", "71", "43", "72", "42", "44"));
+    expectTheSumsToHold();
+}
+
 TEST_F(SessionEndsTest, CarriesOutTheCallsBehindALongStopInTheirOrder)
 {
     play(player, 42);
@@ -316,6 +346,84 @@ TEST_F(SessionEndsTest, LetsGoOfASessionWhoseQueuesRunNoMore)
     player.connection().close();
     platform.workQueues.discardAll();
     EXPECT_TRUE(session.expired());
+}
+
+// --- traces
+
+class TracedSessionEndsTest : public SessionEndsTest {
+protected:
+    TracedSessionEndsTest()
+    {
+        constexpr std::string_view file = "/traces/mix.plist";
+        platform.featureFlags.enable("Sonalis", "Tracing");
+        platform.fileSystem.files.emplace(file, R"(<plist version="1.0"><dict><key>Children</key><array><dict>
+            <key>Name</key><string>startup</string>
+            <key>Children</key><array><dict>
+                <key>Name</key><string>mix</string>
+                <key>Type</key><string>Interval</string>
+                <key>KTraceCodeBegin</key><string>0x21040010</string>
+                <key>KTraceCodeEnd</key><string>0x21040014</string>
+                <key>EventsMatchedBy</key><string>Thread</string>
+            </dict></array></dict></array></dict></plist>)");
+        player.call(CreateReportingSession, 42);
+        player.call(SetServiceType, 11, 42);
+        player.call(SetConfiguration, Dictionary{{"KestoReportingPellorinPlistFilePath", file}}, 42);
+        started = player.submit(StartReportingSessionForID, {42});
+        platform.workQueues.runAll();
+        platform.kernelTrace.deliver({.timestamp = 5000, .threadID = 1, .eventCode = 0x21040010});
+        platform.kernelTrace.deliver({.timestamp = 5007, .threadID = 1, .eventCode = 0x21040014});
+        platform.workQueues.runAll();
+        EXPECT_EQ(player.answersTo(started), answeredOnce(succeeded));
+    }
+
+    [[nodiscard]] std::size_t filesWritten() const { return platform.performanceWriter.files().size(); }
+
+    std::uint64_t started = 0;
+};
+
+TEST_F(TracedSessionEndsTest, LetTheCallsOfOthersGoOnWhileTheTraceEnds)
+{
+    const auto stopped = submitStop(player, 42);
+    const auto other = recorder.submit(GetServiceNameForReporterID, {42});
+    ASSERT_TRUE(platform.workQueues.runOne()); // the stop
+    EXPECT_FALSE(player.session(42)->startedTracing());
+    EXPECT_EQ(filesWritten(), 0U);
+    ASSERT_TRUE(platform.workQueues.runOne());
+    EXPECT_EQ(recorder.answersTo(other), answeredOnce({null, 11}));
+    EXPECT_EQ(filesWritten(), 0U);
+    EXPECT_EQ(player.answersTo(stopped), unanswered);
+
+    platform.workQueues.runAll();
+    ASSERT_EQ(filesWritten(), 1U);
+    EXPECT_THAT(platform.performanceWriter.files()[0]->measurements,
+                ElementsAre(FakePerformanceWriter::Measurement{"mix", 7.0, platform::PerformanceUnit::Nanoseconds}));
+    EXPECT_EQ(player.answersTo(started), (Answers{succeeded, succeeded}));
+    EXPECT_EQ(player.answersTo(stopped), answeredOnce(succeeded));
+    EXPECT_EQ(TraceRunner::numberOfRunners(), 0U);
+    expectTheSumsToHold();
+}
+
+TEST_F(TracedSessionEndsTest, HoldUpNoOtherEnd)
+{
+    for (int message = 0; message < tooManyMessages; ++message)
+        player.call(SendMessage, Dictionary{{"a", message}}, 4, 1, Array{42});
+    play(recorder, 43);
+    platform.kernelTrace.completes = false;
+    platform.log.setObserver([this](const LogLine& line) {
+        if (line.message != "stopping 43")
+            return;
+        EXPECT_EQ(filesWritten(), 0U);
+        const auto& trace = *platform.kernelTrace.sessions()[0];
+        trace.queue->submit(platform::WorkItem(trace.completion));
+    });
+    const auto traced = submitStop(player, 42);
+    const auto other = submitStop(recorder, 43);
+    platform.workQueues.runAll(); // or the wait for the trace finds nothing left that could end it
+    platform.log.setObserver(nullptr);
+    EXPECT_EQ(filesWritten(), 1U);
+    EXPECT_EQ(player.answersTo(traced), answeredOnce(succeeded));
+    EXPECT_EQ(recorder.answersTo(other), answeredOnce(succeeded));
+    expectTheSumsToHold();
 }
 
 // On internal builds a session has volume events, and a file.

@@ -1,6 +1,6 @@
 // The map of a client's sessions against a list that is searched from its beginning.
 #include "client/SessionMap.h"
-#include "support/TestPlatform.h"
+#include "support/ServiceHarness.h"
 
 #include <algorithm>
 #include <gtest/gtest.h>
@@ -22,13 +22,16 @@ Session makeSession(std::int64_t reporterID)
 Entries entries(const client::SessionMap& map)
 {
     Entries entries;
-    for (const auto& [reporterID, session] : map)
-        entries.emplace_back(reporterID, session);
+    client::SessionMap::Place place = 0;
+    while (const auto session = map.sessionBehind(place))
+        entries.emplace_back(session->reporterID(), session);
     return entries;
 }
 
 class SessionMapTest : public testing::Test {
 protected:
+    SessionMapTest() { utility::createServerQueue(); }
+
     support::TestPlatform platform;
     client::SessionMap map;
 };
@@ -37,7 +40,7 @@ TEST_F(SessionMapTest, BeginsEmpty)
 {
     EXPECT_EQ(map.size(), 0U);
     EXPECT_EQ(map.find(0), nullptr);
-    EXPECT_EQ(map.begin(), map.end());
+    EXPECT_EQ(entries(map), Entries());
 }
 
 // Otherwise a client that knows the number of buckets could choose IDs that all fall into one.
@@ -66,8 +69,8 @@ TEST_F(SessionMapTest, KeepsTheOrderInWhichIDsCame)
     for (const std::int64_t reporterID : {3, -1, 2, 0})
         map.set(reporterID, makeSession(reporterID));
     std::vector<std::int64_t> order;
-    for (const auto& entry : map)
-        order.push_back(entry.reporterID);
+    for (const auto& [reporterID, session] : entries(map))
+        order.push_back(reporterID);
     EXPECT_EQ(order, (std::vector<std::int64_t>{3, -1, 2, 0}));
 }
 
@@ -79,7 +82,7 @@ TEST_F(SessionMapTest, GivesAReplacedSessionsPlaceToTheNewOne)
     map.set(1, second);
     EXPECT_EQ(map.size(), 2U);
     EXPECT_EQ(map.find(1), second);
-    EXPECT_EQ(map.begin()->session, second);
+    EXPECT_EQ(entries(map).front().second, second);
 }
 
 TEST_F(SessionMapTest, LetsGoOfReplacedAndRemovedSessions)
@@ -97,6 +100,59 @@ TEST_F(SessionMapTest, LetsGoOfReplacedAndRemovedSessions)
     map.remove(1);
     EXPECT_TRUE(second.expired());
     EXPECT_EQ(map.find(1), nullptr);
+}
+
+// --- walks that pause
+
+TEST_F(SessionMapTest, FindsThePlaceOfAWalkAgainWhateverCameAndWentMeanwhile)
+{
+    for (const std::int64_t reporterID : {5, 4, 3, 2})
+        map.set(reporterID, makeSession(reporterID));
+    std::vector<std::int64_t> visited;
+    const auto visit = [&](const auto& entry) { visited.push_back(entry.reporterID); };
+    const auto second = map.visitBehind(0, 2, visit);
+    ASSERT_NE(second, std::nullopt);
+    map.remove(4);
+    map.remove(3);
+    map.set(1, makeSession(1));
+    EXPECT_EQ(map.visitBehind(*second, 2, visit), std::nullopt);
+    EXPECT_EQ(visited, (std::vector<std::int64_t>{5, 4, 2, 1}));
+}
+
+TEST_F(SessionMapTest, KnowsThoseThatAreStartedInTheOrderOfTheMap)
+{
+    for (const std::int64_t reporterID : {4, 3, 2, 1})
+        map.set(reporterID, makeSession(reporterID));
+    const auto started = [&] {
+        std::vector<std::int64_t> reporterIDs;
+        client::SessionMap::Place place = 0;
+        while (const auto session = map.startedBehind(place))
+            reporterIDs.push_back(session->reporterID());
+        EXPECT_EQ(map.startedCount(), reporterIDs.size());
+        return reporterIDs;
+    };
+    const auto start = [&](std::int64_t reporterID) {
+        support::onServerQueue(platform.workQueues, [&] { map.find(reporterID)->start(); });
+    };
+    const auto stop = [&](const Session& session) {
+        support::onServerQueue(platform.workQueues, [&](platform::Turn& turn) { session->stop(turn); });
+    };
+    for (const std::int64_t reporterID : {1, 3, 4, 2})
+        start(reporterID);
+    EXPECT_EQ(started(), (std::vector<std::int64_t>{4, 3, 2, 1}));
+
+    const auto replaced = map.find(4);
+    map.set(4, makeSession(4));
+    stop(map.find(2));
+    EXPECT_EQ(started(), (std::vector<std::int64_t>{3, 1}));
+    const auto removed = map.find(3);
+    map.remove(3);
+    start(4);
+    stop(replaced);
+    stop(removed);
+    EXPECT_EQ(started(), (std::vector<std::int64_t>{4, 1})) << "the map does not follow sessions that it let go of";
+    map.clear();
+    EXPECT_EQ(started(), std::vector<std::int64_t>());
 }
 
 TEST(SessionMap, IsAListSearchedFromItsBeginning)

@@ -1,4 +1,5 @@
 // Device-wide settings: how they are read, and which sessions get them.
+#include "support/EmittedCodes.h"
 #include "support/ServiceHarness.h"
 
 #include <gmock/gmock.h>
@@ -189,6 +190,75 @@ TEST_F(FeaturesTest, ThatChangeAreSentWhenNothingIsKnownToo)
                             IsLine(Debug, "kerr", "sending message for session owned by 42")));
     EXPECT_THAT(*player.session(42)->nestedAggregatedPayloadData(),
                 ElementsAre(Dictionary{{"Setup_Setup_1", Dictionary{{"audiotag", "SetupSetup"}}}}));
+}
+
+// With each message that a session accepts, a slice of the server queue's time passes; a client has more sessions than
+// one slice reaches.
+class ChangeForManyTest : public FeaturesTest {
+protected:
+    static constexpr std::int64_t sessions = 100;
+
+    ChangeForManyTest()
+    {
+        platform.notifications.setState(ringerNotification, 0);
+        for (std::int64_t reporterID = 1; reporterID <= sessions; ++reporterID) {
+            player.call(CreateReportingSession, reporterID);
+            if (reporterID != 99)
+                player.call(StartReportingSessionForID, reporterID);
+        }
+        platform.traceEmitter.setObserver([this](std::uint32_t code) {
+            if (code == sessionMessageAccepted)
+                platform.clock.advance(0.001);
+        });
+        platform.notifications.setState(ringerNotification, 1);
+        platform.notifications.post(ringerNotification);
+        while (toldOf(1).size() == 1)
+            EXPECT_TRUE(platform.workQueues.runOne());
+    }
+    ~ChangeForManyTest() override { platform.traceEmitter.setObserver(nullptr); }
+
+    // The states of the ringer that the session was told of.
+    [[nodiscard]] std::vector<std::string> toldOf(std::int64_t reporterID) const
+    {
+        std::vector<std::string> told;
+        const auto messages = player.session(reporterID)->nestedAggregatedPayloadData().value();
+        for (const auto& message : messages)
+            told.push_back(message.values()[0].dictionary()->find("ringerstate")->text());
+        return told;
+    }
+
+    TestClient player = harness.connect();
+    TestClient recorder = harness.connect();
+};
+
+TEST_F(ChangeForManyTest, LetsTheCallsOfOthersGoInBetween)
+{
+    const auto other = recorder.submit(CreateReportingSession, {200});
+    while (recorder.answersTo(other) == unanswered)
+        ASSERT_TRUE(platform.workQueues.runOne());
+    EXPECT_THAT(toldOf(1), ElementsAre("0", "1"));
+    EXPECT_THAT(toldOf(sessions), ElementsAre("0"));
+    platform.workQueues.runAll();
+    EXPECT_THAT(toldOf(sessions), ElementsAre("0", "1"));
+}
+
+TEST_F(ChangeForManyTest, IsCompleteBeforeTheNextOneBegins)
+{
+    platform.notifications.setState(ringerNotification, 0);
+    platform.notifications.post(ringerNotification);
+    platform.workQueues.runAll();
+    EXPECT_THAT(toldOf(1), ElementsAre("0", "1", "0"));
+    EXPECT_THAT(toldOf(sessions), ElementsAre("0", "1", "0"));
+}
+
+TEST_F(ChangeForManyTest, IsOlderThanWhatASessionGetsThatStartsMeanwhile)
+{
+    platform.notifications.setState(ringerNotification, 0);
+    const auto started = player.submit(StartReportingSessionForID, {99});
+    platform.workQueues.runAll();
+    EXPECT_EQ(player.answersTo(started), unanswered);
+    EXPECT_THAT(toldOf(99), ElementsAre("0"));
+    EXPECT_THAT(toldOf(sessions), ElementsAre("0", "1"));
 }
 
 TEST_F(FeaturesTest, AreNotSentToSinks)

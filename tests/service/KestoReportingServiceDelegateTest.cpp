@@ -65,10 +65,6 @@ TEST(ServiceMaking, BeginsWithNoClients)
 {
     ServiceHarness harness;
     EXPECT_THAT(harness.service->getAllClients(), IsEmpty());
-    client::ListAllowance allowance;
-    const auto active = onServerQueue(harness.platform.workQueues,
-                                      [&] { return harness.service->getAllActiveReportingSessions(allowance); });
-    EXPECT_THAT(active, IsEmpty());
 }
 
 TEST(ServiceMaking, TakesOnNothingOfAServiceThatIsGone)
@@ -149,12 +145,19 @@ TEST(ServiceDefaults, AreReadOnce)
 
 class ServiceTest : public testing::Test {
 protected:
-    KestoReportingServiceDelegate::Sessions activeSessions()
+    std::vector<std::shared_ptr<KestoReportingSession>> activeSessions()
     {
-        return onServerQueue(platform.workQueues, [&] { return service.getAllActiveReportingSessions(allowance); });
+        return onServerQueue(platform.workQueues, [&] {
+            auto walk = service.getAllActiveReportingSessions();
+            client::ListAllowance allowance;
+            while (walk.logNextClient(allowance)) { }
+            std::vector<std::shared_ptr<KestoReportingSession>> sessions;
+            while (auto session = walk.next())
+                sessions.push_back(std::move(session));
+            EXPECT_EQ(walk.count(), sessions.size());
+            return sessions;
+        });
     }
-
-    client::ListAllowance allowance;
 
     ServiceHarness harness;
     TestPlatform& platform = harness.platform;

@@ -227,6 +227,18 @@ void appendCborMapHead(std::uint64_t count, std::string& out)
     appendHead(Major::Map, count, out);
 }
 
+void appendCborArray(std::span<const std::int64_t> integers, std::string& out)
+{
+    append(longestHead * (integers.size() + 1), out, [integers](char* place) {
+        place = putHead(Major::Array, integers.size(), place);
+        for (const std::int64_t integer : integers) {
+            const auto bits = static_cast<std::uint64_t>(integer);
+            place = integer >= 0 ? putHead(Major::Unsigned, bits, place) : putHead(Major::Negative, ~bits, place);
+        }
+        return place;
+    });
+}
+
 void appendCbor(const Dictionary& dictionary, std::string& out)
 {
     append(sizeOf(dictionary), out, [&](char* place) { return putAt(dictionary, place); });

@@ -15,6 +15,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <expected>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -51,6 +52,8 @@ void appendCborInteger(std::uint64_t value, std::string& out);
 void appendCborText(std::string_view text, std::string& out);
 void appendCborArrayHead(std::uint64_t count, std::string& out);
 void appendCborMapHead(std::uint64_t count, std::string& out);
+// An array of integers, in one step for very many.
+void appendCborArray(std::span<const std::int64_t> integers, std::string& out);
 inline void appendCborNull(std::string& out)
 {
     out.push_back('\xF6');

@@ -16,7 +16,6 @@
 namespace platform {
 
 namespace {
-constexpr Submitter theService{.user = ~0U, .process = 0}; // no user has this number
 constexpr int partIfContested = 4; // of the longest turn
 } // namespace
 

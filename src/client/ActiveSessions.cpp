@@ -1,0 +1,40 @@
+// A session is left out by the number of its run: one that began later is not part of the walk.
+#include "client/ActiveSessions.h"
+
+#include "client/KestoReportingClientServerInstance.h"
+
+namespace client {
+
+bool ActiveSessions::logNextClient(ListAllowance& allowance)
+{
+    if (client_ == clients_.size()) {
+        begin();
+        return false;
+    }
+    logClient_(*clients_[client_++], allowance);
+    return true;
+}
+
+void ActiveSessions::begin()
+{
+    client_ = 0;
+    lastRun_ = KestoReportingSession::lastRunOfAll();
+    for (const auto& client : clients_)
+        count_ += client->clientReportingSessionMap().startedCount();
+}
+
+std::string ActiveSessions::describe(ListAllowance& allowance) const
+{
+    return allowance.describe(count_, [walk = *this]() mutable { return walk.next(); });
+}
+
+std::shared_ptr<KestoReportingSession> ActiveSessions::next()
+{
+    for (; client_ != clients_.size(); ++client_, place_ = 0)
+        while (auto session = clients_[client_]->clientReportingSessionMap().startedBehind(place_))
+            if (session->lastRun() <= lastRun_)
+                return session;
+    return nullptr;
+}
+
+} // namespace client
