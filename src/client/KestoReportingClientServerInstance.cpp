@@ -335,14 +335,20 @@ void KestoReportingClientServerInstance::collectReporters(platform::Turn& turn, 
         return;
     struct Collected {
         client::LongCalls::Place place;
-        client::SessionWalk sessions;
+        client::SessionWalk::Clients clients;
+        std::size_t next = 0;
         ReporterIDs reporterIDs = {};
     };
     const auto delegate = delegate_.lock();
-    const auto all = std::make_shared<Collected>(
-        std::move(place), client::SessionWalk(delegate ? delegate->getAllClients() : client::SessionWalk::Clients()));
-    const auto collectNext = [all](auto&, platform::Turn&) {
-        return all->sessions.visitNext([&](const auto& entry) { all->reporterIDs.push_back(entry.reporterID); });
+    const auto all = std::make_shared<Collected>(std::move(place),
+                                                 delegate ? delegate->getAllClients() : client::SessionWalk::Clients());
+    const auto collectNext = [all](auto&, platform::Turn&) { // a client at once, so that no ID of it comes twice
+        if (all->next == all->clients.size())
+            return false;
+        const client::SessionMap& sessions = all->clients[all->next++]->clientReportingSessionMap();
+        (void)sessions.visitBehind(0, sessions.size(),
+                                   [&](const auto& entry) { all->reporterIDs.push_back(entry.reporterID); });
+        return true;
     };
     inSlices(turn, collectNext, [all, reply](auto& self, platform::Turn& last) {
         if (!self.isConnectionLost_)

@@ -108,8 +108,10 @@ void SessionEnds::stopTrace(platform::Turn& turn, const SharedEnd& end)
 {
     if (!end->run->isTraced())
         return finish(turn, *end);
+    end->run->beginToStopTrace(); // what it collects does not wait for the traces before it
     end->resume = end->lane->pause();
-    on(traces_, [end] {
+    on(traces_, [end, share = platform::LogShare::ofThisThread()] { // the share lives as long as the lane
+        const platform::LogShare::Writing writing(share);
         end->run->stopTrace();
         resume(*end, [end](platform::Turn& last) { finish(last, *end); });
     });
@@ -120,7 +122,8 @@ void SessionEnds::finish(platform::Turn& turn, End& end)
     end.session->finishStop(turn, *end.run);
     end.run.reset();
     end.session.reset(); // before `then` may let go of it
-    end.then(turn);
+    auto then = std::exchange(end.then, nullptr); // the thread may hold the end for a moment longer
+    then(turn);
 }
 
 // The item may run before this returns.
@@ -145,9 +148,9 @@ void SessionEnds::makeQueue(Thread& thread)
     try {
         thread.queue = platform::current().workQueues.makeSerialQueue(thread.name, {});
     } catch (const std::system_error& refusal) { // slower calls are better than a service that ends
-        if (!std::exchange(isRefused_, true))
+        if (!std::exchange(thread.isRefused, true))
             KESTO_LOG(KestoReportingClientCategory(), Error,
-                      "no thread for the ends of long sessions ({}): all calls wait while one stops",
+                      "no thread for the ends of {} ({}): all calls wait while one stops", thread.work,
                       refusal.code().message());
     }
 }

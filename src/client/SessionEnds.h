@@ -42,7 +42,9 @@ private:
     // A queue with a thread, made when it is needed first: most services never need one.
     struct Thread {
         std::string_view name;
+        std::string_view work; // for the log
         std::shared_ptr<platform::WorkQueue> queue = nullptr;
+        bool isRefused = false; // the log says so once
     };
 
     void endShort(platform::Turn& turn, const SharedEnd& end);
@@ -56,9 +58,8 @@ private:
     void on(Thread& thread, platform::WorkItem work);
     void makeQueue(Thread& thread);
 
-    Thread ends_{"com.quarn.kesto.reporting.ends"};
-    Thread traces_{"com.quarn.kesto.reporting.traces"};
-    bool isRefused_ = false; // the log says so once
+    Thread ends_{.name = "com.quarn.kesto.reporting.ends", .work = "long sessions"};
+    Thread traces_{.name = "com.quarn.kesto.reporting.traces", .work = "traces"};
     SharedEnd current_;
     std::map<std::uint32_t, std::deque<SharedEnd>> waiting_; // by user
     std::uint32_t lastUser_ = 0; // whose turn it was

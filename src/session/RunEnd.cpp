@@ -59,6 +59,12 @@ void RunEnd::summarise()
     messagesLost_ = run_->messagesLost();
 }
 
+void RunEnd::beginToStopTrace()
+{
+    if (trace_)
+        trace_->beginToStop();
+}
+
 void RunEnd::stopTrace()
 {
     if (const auto trace = std::move(trace_))

@@ -47,6 +47,7 @@ public:
     // 4. Lets go of the messages; leave it out where the session still has them. Any thread.
     void letGo() { run_.reset(); }
     // 5. Stops the trace, waits for its events and writes its results. A thread that may wait.
+    void beginToStopTrace();
     void stopTrace();
     [[nodiscard]] bool isTraced() const { return trace_ != nullptr; }
     // 6. Adds what the third step counted, and says how many messages of the run were lost for lack of memory.

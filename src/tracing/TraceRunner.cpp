@@ -99,16 +99,18 @@ void TraceRunner::keepProblem(std::string problem)
         problem_ = std::move(problem);
 }
 
+void TraceRunner::beginToStop()
+{
+    if (!std::exchange(isStopping_, true) && !traces_.empty())
+        submitStop(*traces_.front());
+}
+
 void TraceRunner::stopTracingandProcessResults()
 {
+    beginToStop();
     for (const auto& trace : traces_) {
-        KESTO_LOG(KestoReportingTraceCategory(), Info, "Tearing down trace :  {}", trace->name());
-        tracingQueue_->submit([this, &trace = *trace] {
-            if (trace.collectKernelTrace())
-                stopTracing(trace);
-            else
-                tracingCompletionHandler(trace);
-        });
+        if (trace != traces_.front())
+            submitStop(*trace);
         tracingSemaphore_->wait();
         if (trace->collectKernelTrace())
             traceResults_.try_emplace(trace.get(), trace->getResults());
@@ -116,6 +118,17 @@ void TraceRunner::stopTracingandProcessResults()
                   traces_.size());
     }
     writeQuilldat();
+}
+
+void TraceRunner::submitStop(Trace& trace)
+{
+    KESTO_LOG(KestoReportingTraceCategory(), Info, "Tearing down trace :  {}", trace.name());
+    tracingQueue_->submit([this, &trace] {
+        if (trace.collectKernelTrace())
+            stopTracing(trace);
+        else
+            tracingCompletionHandler(trace);
+    });
 }
 
 void TraceRunner::stopTracing(Trace& trace)

@@ -42,8 +42,10 @@ public:
     void createTraceFromTraceParams(const TraceParams* params);
     // Starts every trace. A trace that cannot start is logged, and will be stopped like the others.
     void runTraces();
+    // Tells the first trace to stop, and does not wait: what it collects ends now.
+    void beginToStop();
     // Stops every trace, waits without a limit until each is complete, and writes all results. Ends the process, with
-    // status 1, if the file cannot be opened.
+    // status 1, if the file cannot be opened. Another thread than before may call it.
     void stopTracingandProcessResults();
 
     [[nodiscard]] std::size_t getNumTraces() const { return traces_.size(); }
@@ -58,6 +60,7 @@ private:
 
     void setupTracing(Trace& trace);
     void startTracing(Trace& trace);
+    void submitStop(Trace& trace);
     // These three run on the tracing queue.
     void stopTracing(Trace& trace);
     void tracingCompletionHandler(Trace& trace);
@@ -73,6 +76,7 @@ private:
     const std::uint32_t resultsVersion_ = 4;
     std::unique_ptr<platform::PerformanceFile> perfWriter_;
     std::vector<std::unique_ptr<Trace>> traces_;
+    bool isStopping_ = false; // not by the tracing queue
     std::uint32_t completedTraceCount_ = 0;
     std::unique_ptr<platform::Semaphore> tracingSemaphore_; // raised once for each completed trace
     std::shared_ptr<platform::WorkQueue> tracingQueue_;

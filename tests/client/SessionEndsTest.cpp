@@ -354,7 +354,6 @@ class TracedSessionEndsTest : public SessionEndsTest {
 protected:
     TracedSessionEndsTest()
     {
-        constexpr std::string_view file = "/traces/mix.plist";
         platform.featureFlags.enable("Sonalis", "Tracing");
         platform.fileSystem.files.emplace(file, R"(<plist version="1.0"><dict><key>Children</key><array><dict>
             <key>Name</key><string>startup</string>
@@ -365,21 +364,59 @@ protected:
                 <key>KTraceCodeEnd</key><string>0x21040014</string>
                 <key>EventsMatchedBy</key><string>Thread</string>
             </dict></array></dict></array></dict></plist>)");
-        player.call(CreateReportingSession, 42);
-        player.call(SetServiceType, 11, 42);
-        player.call(SetConfiguration, Dictionary{{"KestoReportingPellorinPlistFilePath", file}}, 42);
-        started = player.submit(StartReportingSessionForID, {42});
-        platform.workQueues.runAll();
+        started = startTraced(player, 42);
         platform.kernelTrace.deliver({.timestamp = 5000, .threadID = 1, .eventCode = 0x21040010});
         platform.kernelTrace.deliver({.timestamp = 5007, .threadID = 1, .eventCode = 0x21040014});
         platform.workQueues.runAll();
         EXPECT_EQ(player.answersTo(started), answeredOnce(succeeded));
     }
 
+    // Returns the call of the start.
+    std::uint64_t startTraced(TestClient& client, std::int64_t reporterID)
+    {
+        client.call(CreateReportingSession, reporterID);
+        client.call(SetServiceType, 11, reporterID);
+        client.call(SetConfiguration, Dictionary{{"KestoReportingPellorinPlistFilePath", file}}, reporterID);
+        const auto start = client.submit(StartReportingSessionForID, {reporterID});
+        platform.workQueues.runAll();
+        return start;
+    }
+    // The kernel has delivered all that it had for the trace.
+    void complete(std::size_t number)
+    {
+        const auto& trace = *platform.kernelTrace.sessions()[number];
+        trace.queue->submit(platform::WorkItem(trace.completion));
+    }
     [[nodiscard]] std::size_t filesWritten() const { return platform.performanceWriter.files().size(); }
 
+    static constexpr std::string_view file = "/traces/mix.plist";
     std::uint64_t started = 0;
 };
+
+TEST_F(TracedSessionEndsTest, EndWhatATraceCollectsWhileAnotherTraceEnds)
+{
+    startTraced(recorder, 43);
+    platform.kernelTrace.completes = false;
+    const auto first = submitStop(player, 42);
+    const auto second = submitStop(recorder, 43);
+    ASSERT_TRUE(platform.workQueues.runOne());
+    ASSERT_TRUE(platform.workQueues.runOne());
+    bool isChecked = false;
+    platform.workQueues.backgroundQueue().submit([&] {
+        isChecked = true;
+        EXPECT_TRUE(platform.kernelTrace.sessions()[0]->ended);
+        EXPECT_TRUE(platform.kernelTrace.sessions()[1]->ended);
+        EXPECT_EQ(filesWritten(), 0U);
+        complete(0);
+        complete(1);
+    });
+    platform.workQueues.runAll();
+    EXPECT_TRUE(isChecked);
+    EXPECT_EQ(filesWritten(), 2U);
+    EXPECT_EQ(player.answersTo(first), answeredOnce(succeeded));
+    EXPECT_EQ(recorder.answersTo(second), answeredOnce(succeeded));
+    expectTheSumsToHold();
+}
 
 TEST_F(TracedSessionEndsTest, LetTheCallsOfOthersGoOnWhileTheTraceEnds)
 {
@@ -405,24 +442,27 @@ TEST_F(TracedSessionEndsTest, LetTheCallsOfOthersGoOnWhileTheTraceEnds)
 
 TEST_F(TracedSessionEndsTest, HoldUpNoOtherEnd)
 {
+    auto other = harness.connect("other");
     for (int message = 0; message < tooManyMessages; ++message)
         player.call(SendMessage, Dictionary{{"a", message}}, 4, 1, Array{42});
     play(recorder, 43);
+    play(other, 44);
     platform.kernelTrace.completes = false;
     platform.log.setObserver([this](const LogLine& line) {
-        if (line.message != "stopping 43")
+        if (line.message != "stopping 44") // it begins to end when the trace does so already
             return;
         EXPECT_EQ(filesWritten(), 0U);
-        const auto& trace = *platform.kernelTrace.sessions()[0];
-        trace.queue->submit(platform::WorkItem(trace.completion));
+        complete(0);
     });
     const auto traced = submitStop(player, 42);
-    const auto other = submitStop(recorder, 43);
+    const auto next = submitStop(recorder, 43);
+    const auto last = submitStop(other, 44);
     platform.workQueues.runAll(); // or the wait for the trace finds nothing left that could end it
     platform.log.setObserver(nullptr);
     EXPECT_EQ(filesWritten(), 1U);
     EXPECT_EQ(player.answersTo(traced), answeredOnce(succeeded));
-    EXPECT_EQ(recorder.answersTo(other), answeredOnce(succeeded));
+    EXPECT_EQ(recorder.answersTo(next), answeredOnce(succeeded));
+    EXPECT_EQ(other.answersTo(last), answeredOnce(succeeded));
     expectTheSumsToHold();
 }
 

@@ -7,7 +7,7 @@ namespace support {
 inline constexpr int playback = 4;
 inline constexpr int setup = 8;
 inline constexpr int routeChange = 10;
-inline constexpr int error = 11;
+inline constexpr int errorCategory = 11;
 inline constexpr int volume = 14;
 // Types.
 inline constexpr int typeStart = 1;

@@ -208,7 +208,7 @@ TEST(ReportOfAService, CountsWhatRunsUpToNowAndWhatWasKilledUpToItsLastWord)
     };
     send(support::playback, support::typeStart,
          {{"session_output_running", true}, {"active_devices", "null-sink"}, {"PomoSessionVolume", 0.5}});
-    send(support::error, support::typeIssueDetector, {{"issue", "late_cycles"}, {"late_cycles", 3}});
+    send(support::errorCategory, support::typeIssueDetector, {{"issue", "late_cycles"}, {"late_cycles", 3}});
     EXPECT_THAT(print({}),
                 MatchesRegex("[0-9]+ s played in 1 session; 1 fault; 1 still running\n"
                              "DAY           PLAYED\n(.|\n)*"

@@ -34,7 +34,7 @@ using foundation::Array;
 using foundation::Dictionary;
 using sdk_test::FakeService;
 using sdk_test::Peer;
-using support::error;
+using support::errorCategory;
 using support::playback;
 using support::typeIssueDetector;
 using support::typeStart;
@@ -197,8 +197,8 @@ TEST_F(TopCommand, KnowsWhatPlaysSinceWhenAndWithHowManyFaults)
     WireClient client(kestod.socketPath());
     play(client, "org.example.player", 1'577'934'200.5);
     send(client, volume, typeState, {{"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 1'577'934'205.5}});
-    send(client, error, typeIssueDetector, {{"late_cycles", 3}});
-    send(client, error, typeIssueDetector, {{"late_cycles", 4}});
+    send(client, errorCategory, typeIssueDetector, {{"late_cycles", 3}});
+    send(client, errorCategory, typeIssueDetector, {{"late_cycles", 4}});
     play(client, "org.example.other", 1'577'934'207, 2);
     send(client, playback, typeStop, {{"session_output_running", false}, {"kestoreporting_timestamp", 1'577'934'208}},
          2);
@@ -225,7 +225,7 @@ TEST_F(TopCommand, SeesWhatChangesBetweenTwoLooks)
     auto looking = tool.start({"top", "--json", "--batch", "--delay", "0.01"});
     EXPECT_THAT(looking->waitForOutput("\"volume\":1,\"faults\":0"), HasSubstr("\"since\":1795264500,"));
     send(client, volume, typeState, {{"PomoSessionVolume", 0.5}, {"kestoreporting_timestamp", 1'795'264'505}});
-    send(client, error, typeIssueDetector, {{"late_cycles", 3}});
+    send(client, errorCategory, typeIssueDetector, {{"late_cycles", 3}});
     const std::string changed = looking->waitForOutput("\"volume\":0.5,\"faults\":1");
     EXPECT_THAT(changed.substr(changed.rfind("\"since\"")), HasSubstr("\"since\":1795264500,"));
     send(client, playback, typeStop, {{"session_output_running", false}, {"kestoreporting_timestamp", 1'795'264'509}});
@@ -249,7 +249,7 @@ TEST_F(TopCommand, ReadsAStoreThatWasReplaced)
     kestod.startAndAwait();
     WireClient next(kestod.socketPath());
     play(next, "second", 1'795'264'600);
-    send(next, error, typeIssueDetector, {{"late_cycles", 3}});
+    send(next, errorCategory, typeIssueDetector, {{"late_cycles", 3}});
     EXPECT_THAT(looking->waitForOutput("\"volume\":1,\"faults\":1"), HasSubstr("\"second\""));
 }
 
