@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Driver statistics: a snapshot of a thousand channels compared with reading the same files in one loop, formatting
 // their changes, and publishing values compared with writing a file for each.
 #include "Groups.h"

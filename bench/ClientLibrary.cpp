@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The cost of sending for the thread that calls libkesto, which may be a real-time thread: time, and system calls (none
 // are allowed). The peer is a program without the library, which writes as many bytes to a socket.
 #include "Groups.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Two steps of a message's path that have peers of their own: decoding CBOR compared with libcbor, and keeping a
 // payload compared with a list of byte strings.
 #include "Groups.h"

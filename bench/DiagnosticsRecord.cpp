@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Encoding and decoding the diagnostics record, compared with the class that protoc generates for the same record. Each
 // side reuses its record and its bytes, as a program with many records does.
 #include "AudioIssueDetected.pb.h"

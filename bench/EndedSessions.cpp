@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The memory that ended sessions leave: that of a service, some time after three long sessions. All rounds wait at the
 // same time.
 #include "Groups.h"

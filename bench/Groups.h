@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The groups of measurements, each in its own file, in the order of the table.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The cost of recording in a growing session, in time and memory.
 #include "Groups.h"
 #include "foundation/cbor/Cbor.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The cost of the service while its clients are silent. All rounds run at the same time, because idle services do not
 // disturb each other.
 #include "Groups.h"

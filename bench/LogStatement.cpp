@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The cost of a disabled log statement: one of the service's own, with expensive arguments, compared with syslog below
 // its mask.
 #include "Groups.h"

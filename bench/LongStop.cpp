@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How long other clients wait at most while a session with a million messages ends. The end is on a thread of its own,
 // with which they share the processors and the service's memory.
 #include "Groups.h"

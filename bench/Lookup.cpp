@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finding a session among those of all clients, in a service with ten thousand clients and in one with a single client.
 //
 // Three cases: the same sessions again and again, as for a sending client; after a pause in which other data filled the

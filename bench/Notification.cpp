@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A device-wide setting changes, and every session of every client gets it.
 #include "Groups.h"
 #include "support/CrowdedService.h"

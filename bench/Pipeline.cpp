@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How many messages a second the service answers for one client that sends without waiting for answers.
 #include "Groups.h"
 #include "peers/BusPeer.h"

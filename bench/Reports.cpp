@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The report and the sessions of a week in which 100,000 sessions sent 1.4 million messages, beside the shell of
 // SQLite, which answers the first question of the same file by SQL. All of it lies in the span of the report: the worst
 // case.

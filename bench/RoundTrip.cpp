@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How long a client waits for the answer to a message. The lower bound is a process that only reads and writes as many
 // bytes.
 //

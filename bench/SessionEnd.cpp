@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The cost of a long session's end: computing the playing times, the file, the summary event, and the memory of all of
 // these.
 #include "Groups.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time from the start of the process until a client has its first answer, in an empty state directory, as after
 // installation.
 #include "Groups.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How long a client waits for the status while the service is busy: no other call may hold it up.
 #include "Groups.h"
 #include "support/ServiceProcess.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How many messages a second become stored events: the service answers when both events of a message are committed; for
 // journald the time ends when its last message can be read back. Measured in a burst, and so long that both move their
 // written data to its final place; each may keep 4 GB. A bare SQLite loop, which writes the same rows and does nothing

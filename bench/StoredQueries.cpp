@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Queries of a store with ten million events: the view must find them by its indexes. The payloads are short, so that
 // the file has less than a gigabyte; a query reads only the rows that it finds.
 #include "Groups.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The cost of a trace after its end: pairing its events, and everything from its stop to the results file.
 #include "Groups.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"

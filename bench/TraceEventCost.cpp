@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel's trace: the cost of an event for its emitter, and how fast the service reads the kernel's pages and
 // orders the events of all processors. Emitting is measured with the real kernel; the peer is a bare write of as many
 // bytes.

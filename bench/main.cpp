@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // kesto_bench: measures the service and its library, each figure with that of a peer in the same run, and prints a
 // table. It is not a test: it reports a missed target, and the exit status is still 0.
 #include "Groups.h"

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 # The common settings of all targets: the language, the warnings, the sanitizers, and two functions so that a folder's
 # CMakeLists.txt names only its files and its neighbours.
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Any process on the machine may send bytes to the CBOR decoder. For all bytes, and after all earlier frames, it must
 // end with a value or an error; and a decoded value must survive its own encoding, byte for byte the second time.
 #include "foundation/cbor/Cbor.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Any program that may publish writes channel files. For all bytes, reading ends with a channel or an error; a channel
 // holds only what its kind allows; its difference from itself is empty; and its difference from nothing is the whole
 // channel.

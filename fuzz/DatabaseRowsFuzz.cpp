@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Fuzzes the reading of damaged databases: no bytes may crash it or keep it for long. The input is the database and,
 // from the place on that its last two bytes name, the log.
 #include "platform/linux/damage/DatabaseRows.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client's bytes, in pieces as the socket may deliver them. For all cuts the reader must yield the same frames, up to
 // the same error; it must not hold more than it got; and decoding the frames must end, with one decoder that keeps its
 // state from frame to frame.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Property lists come from files that any client may name. For all bytes, reading must end with a failure and its text
 // or with a value within the limits; and that value must survive its encoding like any other.
 #include "foundation/cbor/Cbor.h"

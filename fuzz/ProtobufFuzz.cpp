@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Foreign bytes in the wire format of protocol buffers. Reading must end, return nothing from outside the input, and
 // accept a group only if its content alone is well-formed; and a record that was read must stay the same when it is
 // written and read again.

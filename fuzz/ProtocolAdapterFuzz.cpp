@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The content of a frame, as a call: for all bytes, either the adapter calls one operation and its answers go back
 // under the call's number, or it refuses the call, calls no operation and sends no answer. The table of the operations
 // says which. Afterwards no code holds the caller's connection.

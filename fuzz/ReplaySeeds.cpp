@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs a fuzz target on the files of a folder, without a fuzzer: the seeds, which hold every input that once broke it,
 // are a test like any other.
 #include <cstdint>

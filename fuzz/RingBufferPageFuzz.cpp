@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Clients write the content of a page of the kernel's trace, except the heads of its records. For all bytes, its
 // records lie inside it, one behind the other; and pages of several processors yield only the service's own events, in
 // the order of time, up to the requested moment, and each once.

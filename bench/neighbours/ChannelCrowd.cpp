@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The root is a link, so that one step exchanges the trees. Both have channels in every group. They are in memory, as
 // the runtime directory of a service is.
 #include "neighbours/ChannelCrowd.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A channel tree as a hostile user makes it: 65,000 empty folders beside 4,096 channels of another user. The service
 // looks for groups when it starts, and the well-behaved client starts a session, too; both see a small tree, in whose
 // place the other one comes when the flood starts.

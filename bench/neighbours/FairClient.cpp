@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A call counts from the moment at which the client makes it, even if the socket takes it later.
 #include "neighbours/FairClient.h"
 

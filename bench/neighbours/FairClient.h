@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The well-behaved client: it makes its calls 200 times a second, whether or not earlier ones are answered, and notes
 // how long each answer took. Because it does not wait with its next call, a stall shows in every call that falls into
 // it, and not only in one.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Replies of the service name their calls; the daemon answers the calls of a client in their order.
 #include "neighbours/FairClientOf.h"
 

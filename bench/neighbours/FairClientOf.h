@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The well-behaved clients of the service and of dbus-daemon.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One thread serves all connections in turns, and writes whenever a socket takes something.
 #include "neighbours/FloodPipeline.h"
 

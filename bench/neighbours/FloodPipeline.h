@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The common part of most floods: connections through which the same calls go again and again, as many as the sockets
 // take. Memory stays bounded: answers are thrown away, or not even read.
 #pragma once

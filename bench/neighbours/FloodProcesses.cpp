@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A pair of sockets connects each process: it says that it is prepared, or why not, and waits for a byte.
 #include "neighbours/FloodProcesses.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The processes beside the well-behaved client: they prepare, all start at once, and go on until the object goes.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whether a service still works shows in its processor time.
 #include "neighbours/FloodedServices.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The memory that floods leave in the service. It takes time to return, so the services stay until all floods are over,
 // and wait for it at the same time.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One function for each flood, and the table. Ten processes do together what one does alone: each opens its part of the
 // connections, and makes its part of the sessions and messages.
 #include "neighbours/Floods.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What hostile or broken programs do to the service while a well-behaved client uses it.
 #pragma once
 

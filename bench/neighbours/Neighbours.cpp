@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a well-behaved client waits beside floods, from one process and from ten. Peers are processes that only burn
 // processor time, as many as the flood has, and dbus-daemon beside clients that flood it with calls.
 //

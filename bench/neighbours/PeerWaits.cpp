@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Three rounds, because every flood is set against these figures.
 #include "neighbours/PeerWaits.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The waits that floods are compared with: those of a client of a service without a flood, alone and beside processes
 // that only burn processor time, and those of a client of dbus-daemon beside clients that flood it.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // If the service traces, it answers a start immediately, and again at the stop.
 #include "neighbours/TraceStops.h"
 

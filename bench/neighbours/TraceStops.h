@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A flood of traces that stop: each of a session for tests, with a million events that the processes emit themselves.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The log is moved to the database when it has 32 MiB, as in the service.
 #include "peers/BareStore.h"
 

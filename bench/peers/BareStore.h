@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A loop that writes the rows of the store with SQLite and does nothing else: what the disk and SQLite allow.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A server and a client with sd-bus, and the data with which a raw client can replace this client: the bytes of a call,
 // read from the wire, and the length of an answer.
 #include "peers/BusPeer.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The closest peer: the same call over sd-bus, peer to peer, the message as a{sv}, then category, type and the array of
 // reporters. Its server unpacks the whole call, as a service must, and answers.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The daemon counts as running when its socket answers; its output is not read.
 #include "peers/DaemonPeer.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // dbus-daemon as a peer for the cost of an idle service, for the time to start, and for what a flood costs others.
 #pragma once
 

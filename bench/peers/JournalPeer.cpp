@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A process cannot leave a namespace, so journald and the measuring code run in a child, and a socket carries requests
 // and figures.
 #include "peers/JournalPeer.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // journald as a peer: a real, private instance in a mount namespace, in which its sockets and its journal are in
 // private directories, with rate limits off. The machine's own journal is not touched.
 #pragma once

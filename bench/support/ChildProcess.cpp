@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel kills a child with its parent; /proc holds its costs.
 #include "support/ChildProcess.h"
 

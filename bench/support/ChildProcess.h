@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Further processes of a measurement: a service, a peer. They end with the object, and at the latest with the program.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A service inside this process with any number of clients, without the delays of sockets.
 #pragma once
 

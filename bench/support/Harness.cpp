@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contestants take turns by rounds, so that disturbances by the machine affect all of them.
 #include "support/Harness.h"
 

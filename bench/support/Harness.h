@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The common part of all measurements: rounds in which the contestants take turns, and medians.
 //
 // The machine's noise comes in stretches. So a figure and its peer's are measured round by round in turns, and the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The platform of what is measured inside this process. It costs no time, so that only the service's own work remains:
 // a queue runs each item immediately, no event is wanted, the log drops its lines and has the default levels, no driver
 // publishes a channel, and no trace runs. It has no files unless a file system is given; then it is that of an internal

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Requests are one string in which only the number changes, and answers are only counted in bytes, so that the client's
 // own cost in a measurement is minimal.
 #include "support/RawClient.h"

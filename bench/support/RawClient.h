@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The simplest client: it writes a request that was encoded before, and reads as many bytes as the answer has. It calls
 // the service and the peers alike, so that only the servers differ.
 #pragma once

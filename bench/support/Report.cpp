@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Rows become text and JSON only at the end, when the columns' widths are known.
 #include "support/Report.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The results: one row for each figure, with the peer's figure and the target. Shown as a table for people and as JSON
 // for programs.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The message holds each kind of value that players send.
 #include "support/SampleMessage.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The message of all measurements: ten entries such as a player sends when its output starts, about 256 bytes of CBOR.
 // A running number makes every message different, so that it is recorded.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Clients connect as soon as the socket exists, and use the wire protocol directly.
 #include "support/ServiceProcess.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The real service, in directories of its own, and its clients' messages.
 #pragma once
 

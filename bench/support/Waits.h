@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What clients waited, one figure of each kind for each round.
 #pragma once
 

@@ -1,4 +1,5 @@
 #!/usr/bin/env python3
+# SPDX-License-Identifier: Apache-2.0
 """Plays with aplay, and reports what it plays: format, device, gaps, start and stop.
 
     python3 aplay.py music.wav

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A tiny driver helper that publishes a mixer's statistics: how many cycles were late, how long cycles take, and
 // whether it runs. The service reports at the end of each session how these changed.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A tiny player that reports what it plays: how long, at which volume, on which device.
 //
 //     cc player.c $(pkg-config --cflags --libs kesto) -o player && ./player

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A tiny player that reports what it plays, and goes on reporting after a restart of the service.
 //
 //     c++ -std=c++17 player.cpp $(pkg-config --cflags --libs kesto) -o player && ./player

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A program that makes its session and its messages itself, with keys of its own beside those that the service uses.
 // Programs that only play or record have less to do: see player.c.
 //

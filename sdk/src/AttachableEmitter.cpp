@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All steps that can fail come before the exchange, which is one system call.
 #include "AttachableEmitter.h"
 

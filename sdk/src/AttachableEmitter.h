@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client's threads emit trace events through it, while the client's own thread connects, loses its connection and
 // connects again.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A caller's function with its user pointer, released exactly once, even if the call fails.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client's options with their defaults filled in.
 #pragma once
 

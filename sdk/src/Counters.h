@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Counts of sent, answered and lost messages, which can be read at any time.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Lets any number of callers wake one thread, without a system call while it is awake.
 //
 // The thread sets `isAsleep_` before it sleeps, and then checks once more for work. Callers first leave their work and

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time of what a program reports, on the two clocks that reports need.
 //
 // The uptime is that of CLOCK_BOOTTIME, which goes on while the device sleeps. Both clocks are read without a system

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Threads of the library: they never handle the signals of the program.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A session is left out by the number of its run: one that began later is not part of the walk.
 #include "client/ActiveSessions.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The started sessions of all clients, in the order in which the clients registered, and then in that of their maps.
 //
 // There may be a hundred thousand. So this is not a list but a walk, which may pause: clients and sessions may come and

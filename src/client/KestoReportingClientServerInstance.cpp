@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The client's life and its operations on sessions. Delivering messages is in a file of its own.
 #include "client/KestoReportingClientServerInstance.h"
 

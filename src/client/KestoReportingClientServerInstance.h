@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One connected client: it owns the client's sessions and carries out its calls on them, on the event sinks and
 // on the service object.
 //

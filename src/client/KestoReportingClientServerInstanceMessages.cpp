@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Delivering a message to each of its sessions, and beside each session to every sink.
 //
 // A message to every started session reaches each session before its sinks; in all other cases the sinks come first.

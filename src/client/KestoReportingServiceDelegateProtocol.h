@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a client object may ask of the one service object.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The interface that the service exports on every client connection.
 //
 // Every operation is one-way. It answers through its reply, perhaps later than operations that were called after it,

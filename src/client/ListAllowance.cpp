@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A list counts when it is made, which a log statement does only for a line that it writes.
 #include "client/ListAllowance.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The lists of sessions that a client's calls write into the log.
 //
 // A call of a few bytes may log a line about every session of every client. So each client has an allowance of bytes a

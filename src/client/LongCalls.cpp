@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A user's place passes from call to call without being free in between, so that the calls keep their order.
 #include "client/LongCalls.h"
 

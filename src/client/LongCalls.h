@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Calls that reach very many sessions: of each user one at a time.
 //
 // Such a call goes on in slices, so that others run in between, and keeps meanwhile what it has gathered: a message, or

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of the operations that the service offers to clients. The service, the client library and the tool read it.
 //
 // A row holds all that a frame needs: the operation's number on the wire, its arguments and its result. Both ends of a

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of the operations says which arguments a call has; the parameters of the operation's function say which
 // types they become. The arguments are taken one by one; the first wrong one decides what the log says about the call.
 #include "client/ServiceProtocolAdapter.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The adapter between the wire and the protocol: checks the array of values that a client sent, calls the operation
 // that it names, and turns each reply into a frame.
 //

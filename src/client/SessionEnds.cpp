@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The long steps of an end run on the thread, and those that need a turn on the lane of the client. Each step submits
 // the next, so at any time one thread at most has the end.
 #include "client/SessionEnds.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The ends of long sessions: on a thread of their own, so that only the client that stops one waits for it.
 //
 // The session itself stops at once, for everyone. Its messages stay behind until the end is over: as long as they take

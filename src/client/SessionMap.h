@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client's sessions by reporter ID, in the order in which the client first used the IDs.
 //
 // A session that replaces another takes its place in the order. Looking up, adding and removing cost the same for any

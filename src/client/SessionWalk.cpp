@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A few sessions at a time, so that finding the place again and reading the clock cost next to nothing.
 #include "client/SessionWalk.h"
 

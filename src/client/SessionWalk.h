@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All sessions of some clients, in the order of the clients and then in that of their maps.
 //
 // There may be a hundred thousand. So the walk may pause: clients and sessions may come and go meanwhile.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The first request submits an item, which serves all that came before it runs; those that come while it reads wait
 // for the next.
 #include "driver/ChannelMoments.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads the drivers' channels on a thread of its own, because the server queue must not wait for files, of which every
 // user may publish many. A reading serves all who asked before it began: however many sessions start and stop, one
 // reading runs at a time.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One group of driver channels to subscribe to.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Subscribing to the drivers' channels and sampling them.
 #include "driver/KestoReportingDriverUtility.h"
 

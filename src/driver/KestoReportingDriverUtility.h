@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The driver-statistics sampler: subscribes once to the channels of audio and haptics drivers, takes snapshots, and
 // reports how the drivers' counters changed during a session.
 #pragma once

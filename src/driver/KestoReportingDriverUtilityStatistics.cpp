@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How the drivers' channels changed during a session, as text: one entry for each channel, in a dictionary for each
 // kind of channel.
 #include "driver/KestoReportingDriverUtility.h"

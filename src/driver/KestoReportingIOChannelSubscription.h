@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One live subscription to a driver's channels.
 #pragma once
 

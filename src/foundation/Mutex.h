@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A mutex with annotations, by which clang proves that guarded fields are used only under their lock; and a condition
 // on which a thread waits while it holds the mutex.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of all counts.
 #include "ledger/Counter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Everything that the service counts, in one table: what came in, what became of it, and what was left out and why.
 //
 // Who adds a limit or another way to lose something adds a row here, and the row reaches every reader: the answer to

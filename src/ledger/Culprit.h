@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whose messages and events were refused, lost or removed: a user, a process and an application.
 #pragma once
 

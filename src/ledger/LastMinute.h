@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How much came in the last minute, counted by seconds, so that reading it needs no timer.
 #pragma once
 

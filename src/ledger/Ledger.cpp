@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Posting counts, and reading what stands in the ledger.
 #include "ledger/Ledger.h"
 

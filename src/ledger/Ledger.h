@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The ledger: what came in, what became of it, and what was left out, why and by whose doing. There is one ledger in
 // the process, and everything that drops, refuses or loses something counts it here.
 //

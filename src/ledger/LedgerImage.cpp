@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading and writing the slots.
 #include "ledger/LedgerImage.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The ledger as bytes: in memory, and in the file that survives the process. The service counts in these bytes, so a
 // killed service loses no count.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rows of one group stand together in the table of counters, so one pass over it makes the nested dictionaries.
 #include "ledger/Report.h"
 

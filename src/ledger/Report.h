@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What stands in the ledger, as one dictionary: the answer to `status`, and what `kesto status` prints for programs.
 //
 // Every counter of the table is there, also when it is 0: its path gives the keys, keys within keys. docs/status.md

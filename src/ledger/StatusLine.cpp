@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a report says to people in few words.
 #include "foundation/text/Format.h"
 #include "foundation/text/LocalTime.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Adding and moving counts.
 #include "ledger/Tally.h"
 

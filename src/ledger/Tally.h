@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Counts that belong together and reach the ledger together: what one turn of the server queue did, or one batch of the
 // store. So the ledger's sums hold at every moment, and also in what a killed service leaves behind.
 #pragma once

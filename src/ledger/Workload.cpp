@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A name costs memory only while its client is connected, or while it is one of the largest of those that went.
 #include "ledger/Workload.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Who makes the service work: how many calls each process made, how long they took, and how many bytes came from it.
 //
 // Each client has a workload while it is connected. The totals of those that went are kept by user and process: beyond

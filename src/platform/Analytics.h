@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The analytics-event service: keeps the events that the device's configuration selects by name.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Signatures, which are the same for all providers.
 #include "platform/BugCapture.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The automatic bug-capture service: takes a diagnostic snapshot of the device under a signature.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Time, as a service, so that no test sleeps to make it pass.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Inter-process connections, as the service sees them: a listener with a delegate, and connections that
 // deliver calls and carry replies back.
 //

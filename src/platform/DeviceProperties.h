@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Facts about this device that its maker set, such as whether it runs an internal build.
 #pragma once
 

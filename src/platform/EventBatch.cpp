@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All texts stand in one buffer, behind each other, so that an event needs none of its own.
 #include "platform/EventBatch.h"
 

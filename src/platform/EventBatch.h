@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Events on their way to the keeper, written in the form in which it stores them, and who sent them.
 //
 // The two events of a message, one for all services and one for its own, differ only in their names: they are one row

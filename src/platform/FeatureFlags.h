@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Feature flags: switches of the device's software, by domain and name.
 #pragma once
 

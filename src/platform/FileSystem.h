@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service's work with files: it writes its own files, all below one folder, and reads files that clients name.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel event trace service: sessions that deliver the kernel's trace events of a range of codes.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How the letters of a turn become one for each connection.
 #include "platform/Letters.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The frames that a turn sends, held back until the turn is over and what it stored is kept: a client that reads an
 // answer may rely on it.
 //

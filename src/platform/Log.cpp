@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes a record of an enabled statement: the message is formatted here for all statements, so that each statement is a
 // small call.
 #include "platform/Log.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Log categories and the statements that write to them.
 //
 // A disabled statement costs a load and a branch: its arguments are not evaluated. The line of an enabled statement

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A bucket of lines that fills up as time passes.
 #include "platform/LogShare.h"
 

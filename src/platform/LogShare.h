@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What one client may write to the log: many lines at once, and then so many a second; of errors as many again, so that
 // other lines displace none. So a client that makes a hundred thousand calls a second costs the service neither the
 // processor nor the disk for as many lines, and displaces no lines of others.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The memory of the process, as the rest of the system sees it.
 #pragma once
 

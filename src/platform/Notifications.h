@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // System notifications: names that processes post, each with a 64-bit state.
 #pragma once
 

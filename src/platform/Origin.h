@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Who is behind an event: the connection that it came over, its source, and the session that it belongs to.
 //
 // Events carry numbers, because a name for each event would cost as much as the event. What the numbers stand for is

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The performance-data writer: one file of named measurements.
 #pragma once
 

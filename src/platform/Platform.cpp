@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The installed platform, and the log categories that have their threshold from it.
 #include "platform/Platform.h"
 

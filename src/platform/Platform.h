@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The bundle of platform services that the process runs on.
 //
 // The entry point installs it once, before anything else runs; tests install fakes. Free functions

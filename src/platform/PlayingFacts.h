@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a message says about playing and recording. It is read beside the time stamp, where the payload becomes JSON.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The preferences store: values by domain and key, changed by the device's owner while the service runs.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel's reporting channels: counters, histograms and state residencies that audio drivers publish,
 // found by group and subgroup, sampled together.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Events of this service in the kernel's trace.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What one turn of the server queue gathers: events for the store, the letters that leave when the events are kept, and
 // the counts that the ledger gets then.
 //

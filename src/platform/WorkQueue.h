@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Work queues: named serial queues, the background concurrent queue, and work that starts later.
 //
 // Order: a serial queue runs one item at a time, in the order in which they were submitted; only those of its lanes

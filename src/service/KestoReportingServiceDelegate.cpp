@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service object's making, its defaults, and the registry of clients.
 #include "service/KestoReportingServiceDelegate.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one service object: it accepts connections, keeps the registry of clients, and holds the common state of all
 // clients: the defaults, the master switch, the device-wide features.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A connection's beginning and end: the service makes and registers the client object; when the peer has gone, it stops
 // the client's sessions and sends an event with the time that the client was connected.
 #include "client/KestoReportingClientServerInstance.h"

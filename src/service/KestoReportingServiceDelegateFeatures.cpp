@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Device-wide settings as messages: the accessory setting of the home screen, the device's name and the ringer
 // switch are sent to a session when it starts, and to all sessions when one of them changes. One change follows the
 // other on a lane of their own, so that others go on while a hundred thousand sessions get one.

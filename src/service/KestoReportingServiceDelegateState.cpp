@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The description of the service in a bug capture: the numbers of clients and sessions, and the first sessions, so few
 // that the description does not delay the requesting thread.
 #include "client/KestoReportingClientServerInstance.h"

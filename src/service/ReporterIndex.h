@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which session a reporter ID means, so that a look-up over all clients costs the same for any number of clients. By
 // definition the result is that of a walk over the registry, in the order of registration, that stops at the first
 // client with the ID; so the index keeps the clients of an ID in that order.

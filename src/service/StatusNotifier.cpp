@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The ledger keeps the notifier while it awaits a change, and the queue while a renewal is due.
 #include "service/StatusNotifier.h"
 

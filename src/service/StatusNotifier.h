@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one line about the service that the service manager shows: renewed when something was counted, but at most every
 // five seconds. While nothing is counted, nothing runs.
 #pragma once

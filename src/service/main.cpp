@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // kestod: puts the service object on the Linux platform and gives the main thread to the listener, until a signal ends
 // the process. The launch configuration is in the environment; on its command line it only answers who it is.
 #include "ledger/Report.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the audio drivers' channels held at one moment, by driver.
 #pragma once
 

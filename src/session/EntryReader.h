@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads payloads one after the other, entry by entry, where most entries repeat those of the payload before.
 //
 // A player sends the same keys in the same order, and most values do not change. So the reader compares each entry,

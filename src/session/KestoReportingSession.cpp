@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The session's life: creation, configuration, start, stop and teardown.
 #include "session/KestoReportingSession.h"
 

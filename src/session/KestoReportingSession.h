@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One reporting session of one client process: its identity, service type and configuration, and, between start and
 // stop, the messages that it got.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A session's handling of a message: it normalises it, compares it with the previous one of its kind, and records it.
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"

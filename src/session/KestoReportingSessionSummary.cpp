@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The session's summary: one event with every value of each key and, on internal builds, all messages in a file that
 // diagnostic tools read.
 #define KESTO_LOG_NAME "KestoReportingSession"

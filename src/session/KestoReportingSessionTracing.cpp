@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The trace of a session: when a session is traced, with the parameters file that its configuration names.
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "platform/Platform.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a session's messages say about its playing: the session replays them in order, and each stretch during which
 // output ran unchanged becomes a volume event.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How payloads are laid out in memory, how they are paid for, and when a message is a repetition.
 #include "session/MessageStore.h"
 

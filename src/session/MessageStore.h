@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The messages of one run of a session, in the order of acceptance, each under an identifier made of its kind
 // and a running number ("Volume_Summary_3").
 //

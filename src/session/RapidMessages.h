@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Folds each burst of messages a fraction of a second apart, as switches cause them, into one payload.
 //
 // The caller decides what is read of a message and how two are merged: the volume analysis needs only a few entries of

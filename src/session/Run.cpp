@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What becomes of each message that a run gets.
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "session/Run.h"

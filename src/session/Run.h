@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The messages of one run of a session, from its start to its stop, and what is made of them.
 //
 // The session shares its run with the work that ends it, which may go on when the session itself has stopped

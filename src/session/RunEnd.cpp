@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The steps of a run's end.
 #define KESTO_LOG_NAME "KestoReportingSession"
 #include "session/RunEnd.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a session's stop makes of its run, step by step: the volume events, on internal builds the file, and the summary
 // event; then the messages are let go, and the trace stops.
 //

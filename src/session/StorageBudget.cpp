@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What is taken from a budget never exceeds its limit at that time, nor that of the budgets around it.
 #include "session/StorageBudget.h"
 

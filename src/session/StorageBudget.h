@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How much memory the service may use for what it keeps for clients. The service has one budget, within it each user
 // has one, and within that each client, so that neither a client nor a user nor all together can fill the device's
 // memory. The platform tells the limits, which its owner may change at any time.

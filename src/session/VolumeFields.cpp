@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finding the volume analysis's fields among the entries of a message.
 #include "session/VolumeFields.h"
 

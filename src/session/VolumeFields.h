@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The entries of a message that the volume analysis reads.
 //
 // They stay encoded, in the store's own memory: the end of a session looks at every message, and unpacking all of them

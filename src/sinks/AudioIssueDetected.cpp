@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The record's fields on the wire, in its text, and in comparisons.
 #include "sinks/AudioIssueDetected.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The wireless-diagnostics metrics service's record of a detected audio issue. It is part of the message set, so that
 // programs can read a received record and make one; no sink of this service sends it.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Both events of a message share one payload, which is built when the first event needs it.
 #include "sinks/KestoReportingFennicBridge.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The bridge to the analytics service: turns a message into events that carry its category and type in
 // their names, one for all services and one for the session's own.
 //

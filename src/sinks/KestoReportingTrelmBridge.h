@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The wireless-diagnostics sink. It accepts every message and does nothing with it: with this entry point such a
 // service can be added without a change in the path of a message.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One step for each message: it is not a report, or repeats the last one, or is counted, or is the second report, which
 // requests a snapshot.
 #include "sinks/KestoReportingVorpStateManagerUtility.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Watches for haptics hardware that keeps running: if a second, different report of haptic hardware time comes after a
 // first one, a session has probably leaked, and this class requests a snapshot from the bug-capture service.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A sink's view of a session: only what it needs to name an event and the application.
 #pragma once
 

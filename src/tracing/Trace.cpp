@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Passes the events to each measurement and collects the results.
 #include "tracing/Trace.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One trace: its measurements and their results.
 #pragma once
 

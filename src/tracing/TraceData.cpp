@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The average, in single precision, as its callers expect.
 #include "tracing/TraceData.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A measurement of a trace: each object reads all events of a finished trace and keeps the values that it measures.
 //
 // A trace may hold millions of events and tens of thousands of results. Both are plain data in vectors: reading an

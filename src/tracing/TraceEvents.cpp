@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The budget is used only when a list grows, so that keeping an event costs no more than copying it.
 #include "tracing/TraceEvents.h"
 

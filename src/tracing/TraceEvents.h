@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The events of one trace while it runs, in memory that all traces share.
 //
 // Clients decide how many events come. So every trace has a first room, and further memory comes from one budget of the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Pairs events in one pass. Only the last start of each thread is kept.
 //
 // Events are large and many, so memory access takes most of the time: prefetching events makes pairing some 1.2 times

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time from an event of one code to the next event of another: on the same thread, or on any thread.
 //
 // A start that is followed by another start, and a stop without a start, are discarded and counted. If both codes are

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The content of a trace-parameters file: which kernel events delimit the intervals that a trace measures; and the keys
 // and values of such files, for programs that write them.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A nested value of a wrong kind counts as empty, so that reading goes on after a failure.
 //
 // The codes and the type of a point are kept for the next points, which override only the values that they have: a

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads the trace-parameters file that a session's configuration names.
 //
 // A client names the file, so it may be missing, a pipe, a gigabyte large, not a property list, or one of the wrong

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads one argument of each event of the code.
 #include "tracing/TracePoint.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The values that events of one code carry in one of their arguments. It is part of the model of traces. The runner of
 // this service makes intervals only, so only tests make it.
 #pragma once

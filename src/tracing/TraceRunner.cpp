@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The life of a trace: set up, started, ended, completed.
 #include "tracing/TraceRunner.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs the traces of one reporting session: collects the kernel's events while the session runs, and at its end
 // measures them and writes the results to a file.
 //

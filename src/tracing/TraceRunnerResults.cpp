@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The end of a runner's work: a summary of each name in the log, and every value in the results file.
 #define KESTO_LOG_NAME "TraceRunner"
 #include "platform/Platform.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What every end of the process has in common, whether it ends in order or in the middle of its work.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Small functions on the platform's clock, process table and device properties, and on payloads.
 #include "utility/KestoReportingUtility.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Functions that the service, its clients, its sessions and its sinks share: waiting, process names, payload
 // normalisation, bucketing. They keep no state except the build kind, which is read once.
 //

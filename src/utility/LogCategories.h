@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The log categories of the service, one for each subject, so that a reader of the log can follow one subject.
 //
 // Constant globals behind accessors: a disabled log statement costs a load and a branch.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The tables of the names. A name's index in its table is its number.
 #include "utility/MessageKinds.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kinds of messages: event categories, event types and service types, with their names and the small policies that
 // depend on them.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one error in answers to clients, and the callbacks that carry answers.
 #pragma once
 

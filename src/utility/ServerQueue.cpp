@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The place of the queue.
 #include "utility/ServerQueue.h"
 

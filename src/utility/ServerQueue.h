@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The server queue: the one serial queue for everything that touches clients and sessions, so that none of it needs a
 // lock.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The codes of the service's own events in the kernel's trace, which show its work between the events of drivers and
 // clients.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A part of long work on the server queue: between two parts, the calls of other clients run.
 //
 // A part is a little longer than a turn, so that the change between lanes costs next to nothing. It ends by the time

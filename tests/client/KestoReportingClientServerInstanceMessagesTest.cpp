@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The delivery of a message: its receivers, its order, and its sender.
 #include "client/KestoReportingClientServerInstance.h"
 #include "support/EmittedCodes.h"

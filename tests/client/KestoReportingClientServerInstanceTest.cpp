@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client's operations on sessions, called through the protocol: their answers, their log lines in order, and which
 // client's sessions each of them reaches.
 #include "client/KestoReportingClientServerInstance.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How much of the log a client's calls fill with lists of sessions.
 #include "client/ListAllowance.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The wire, call by call: which operation a frame means, which frames are refused and with which words, and the form of
 // answers.
 #include "client/ServiceProtocolAdapter.h"

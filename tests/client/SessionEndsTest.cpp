@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A long stop holds up the client that makes it, and no other; for everyone else the session is stopped at once. Many
 // sessions end one after the other.
 #include "client/SessionEnds.h"

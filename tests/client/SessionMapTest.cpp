@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The map of a client's sessions against a list that is searched from its beginning.
 #include "client/SessionMap.h"
 #include "support/ServiceHarness.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Driver logs of channels that are published as files: the whole path from the file to the event, with all changes of
 // files in between.
 #include "driver/KestoReportingDriverUtility.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How the drivers' channels changed during a session, as text, and which services get the text.
 #include "driver/KestoReportingDriverUtility.h"
 #include "support/DriverMoment.h"

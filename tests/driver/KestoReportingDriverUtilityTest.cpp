@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Subscribing to the eight driver groups, and snapshots of them.
 #include "driver/KestoReportingDriverUtility.h"
 #include "support/DriverMoment.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Clients that break the protocol: each ends its own connection, with one logged line, and touches nothing else.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

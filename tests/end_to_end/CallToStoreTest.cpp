@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The whole path, from a client's call to a stored event, through a real service.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/Sums.h"

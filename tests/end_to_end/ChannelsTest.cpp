@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Channels that a driver helper publishes with libkesto, up to the stored event with their change during a session.
 #include "kesto/channels.hpp"
 #include "end_to_end/Kestod.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service with few descriptors: clients take their part and no more, and its own work goes on.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

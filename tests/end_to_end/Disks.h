@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Disks that are small or read-only, in place of the service's state directory or over its database. They need the
 // right to mount, which root has.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The end in order: on SIGTERM and SIGINT the service ends its connections as if the clients had gone, keeps what this
 // yields, and ends with status 0, within five seconds in any case.
 #include "end_to_end/Kestod.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Faults of every kind, and what the ledger says after each: nothing goes uncounted.
 #include "end_to_end/Disks.h"
 #include "end_to_end/Kestod.h"

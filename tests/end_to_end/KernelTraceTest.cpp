@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A real kernel trace: the service measures the events that a program emits from several threads, and the program's own
 // clock agrees.
 #include "end_to_end/Kestod.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The process gets an environment of its own, with only the sanitizers' variables from the test, and ends with SIGKILL,
 // because its guarantees must hold even then. The tests read its store by SQL, as any user may.
 #include "end_to_end/Kestod.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A real service process on a private socket, in directories of its own.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Starting: the source of the socket, the error without one, and the notification of readiness.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/ServiceManager.h"

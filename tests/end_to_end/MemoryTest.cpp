@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service's memory when long sessions end, as the system sees it: how large it becomes, and that the system gets it
 // back.
 #include "end_to_end/Kestod.h"

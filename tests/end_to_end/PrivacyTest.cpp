@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the device owner's switches keep out of the store, looked for in the bytes of its files.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/Sums.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a service manager does for a service: it binds the socket, and hears how the service is.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A library to be loaded before all others: it shifts the time of day of one process, by the seconds that stand in a
 // file, so that a real service lives through a clock that is set. The clocks that no one can set stay as they are, and
 // so do the stamps of files, which the kernel makes, with the clock that is compared with them.

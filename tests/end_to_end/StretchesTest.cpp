@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Playing times, on every build: from the messages of a real client to the table of stretches, through every end that a
 // stretch can have.
 #include "end_to_end/Kestod.h"

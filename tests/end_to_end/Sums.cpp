@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The file of the ledger is read like any other: only its format is used, so that no code of the service checks itself.
 #include "end_to_end/Sums.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the service counted, against what its store holds: the three sums of the ledger, and that each loss of events is
 // charged to a culprit.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // As many connections as the service allows, whose clients send and never read: the service's memory stays bounded, and
 // others are served.
 #include "end_to_end/Kestod.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Blocking, and with only the encoding of single values from the service, like a foreign client. A missing answer is an
 // exception, so that a test never hangs.
 #include "end_to_end/WireClient.h"

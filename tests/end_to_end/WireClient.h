@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client that sends frames and, for some tests, other bytes.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Bytes right before an inaccessible page: code that reads one byte beyond them ends the test program, with or without
 // a sanitizer.
 #pragma once

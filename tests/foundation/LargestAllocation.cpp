@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The program's own operator new records the largest request.
 #include "foundation/LargestAllocation.h"
 

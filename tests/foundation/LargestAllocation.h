@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The largest single allocation, to prove that the code does not allocate for a hostile length.
 #pragma once
 

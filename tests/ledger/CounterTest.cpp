@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of all counts: its paths are read by programs, so they stay the same for good.
 #include "ledger/Counter.h"
 

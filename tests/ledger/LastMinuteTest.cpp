@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How much came in the last minute.
 #include "ledger/LastMinute.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a ledger leaves behind: whole after a kill at any moment, readable by other versions.
 #include "ledger/LedgerImage.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Posting and reading counts.
 #include "ledger/Ledger.h"
 

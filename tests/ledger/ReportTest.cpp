@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The ledger as one dictionary: its shape, and where each count stands in it.
 #include "ledger/Report.h"
 

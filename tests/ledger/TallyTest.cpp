@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Counts on their way to the ledger.
 #include "ledger/Tally.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Who makes the service work: sums by user and process, of those who are there and of those who went.
 #include "ledger/Workload.h"
 

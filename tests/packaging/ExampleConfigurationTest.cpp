@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The example configuration files are correct, and hold only the defaults, with which the units agree.
 #include "platform/linux/memory/MemoryConfiguration.h"
 #include "platform/linux/settings/TomlFile.h"

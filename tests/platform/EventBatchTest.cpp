@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rows that a batch gives to the database: their texts stay right when batches are joined, both events of a message
 // share one written payload, and payloads that JSON cannot express are left out.
 #include "platform/EventBatch.h"

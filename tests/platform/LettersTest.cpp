@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The letters of a turn: what one connection gets arrives as one letter, in the order in which it was written, and
 // nothing is written before the letters are sent.
 #include "platform/Letters.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client's share of the log, with moments that the test makes up.
 #include "platform/LogShare.h"
 

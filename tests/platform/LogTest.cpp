@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Log statements: a disabled statement does not evaluate its arguments, an enabled one shows its place in the source.
 #include "platform/Log.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The program's own operator new counts allocations, separately for each thread.
 #include "sdk/Allocations.h"
 

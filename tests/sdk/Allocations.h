@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Counts a thread's allocations, so that a test can prove that a function does not allocate.
 #pragma once
 

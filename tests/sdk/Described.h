@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Calls as a test reads them: "create", "type 7", "Volume State {...}", with the message as JSON.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libkesto as its users get it: installed, found with pkg-config or CMake, and linked by programs outside of the source
 // tree. The examples must compile without a warning, and report as they describe.
 #include "kesto/kesto.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One thread and one poll for all peers; a test accesses them through that thread.
 #include "sdk/FakeService.h"
 

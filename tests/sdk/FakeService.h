@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The other end of the wire, in the test's own process: uses the protocol over a real socket, records the calls, and
 // answers as the test wants.
 #pragma once

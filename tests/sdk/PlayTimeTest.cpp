@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The play times that a real service computes and stores, from a player that links the library, also when the service
 // goes and comes back. The player's clocks move only by what it plays.
 #include "sdk/PlayTimes.h"

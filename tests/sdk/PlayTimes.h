@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How a test sees the play times of a program that links the library: the program's surroundings, and what a real
 // service stored.
 #pragma once

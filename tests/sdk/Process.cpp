@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A thread collects the program's output, so that the program never waits for its reader, and a process descriptor
 // shows its end.
 #include "sdk/Process.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Programs that a test runs: input, output, exit status. The destructor ends a running program.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Records the calls of a client's callbacks, and lets a test wait for them.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A player that does what its input says, so that a test can let the service go and come back in between: "start",
 // "pause", "resume", "stop", "volume 0.5", "route headset", "play 3" (seconds), "flush" (waits until the service has it
 // all), "await connected", "await disconnected" and "say done". It ends with its input.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client and the service that it talks to, for tests of the library's calls.
 #pragma once
 

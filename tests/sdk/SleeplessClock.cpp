@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A library to be loaded before all others: the clocks of the program stand still until it sleeps. Then it goes on at
 // once, and they have moved by the time that it wanted to sleep. So a test of how long a program plays takes no longer
 // than the calls themselves, and knows the seconds.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The public header and the service have the same words for trace-parameters files.
 #include "tracing/TraceParams.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Emitting trace events while a client connects, gets the marker, and loses its connection again. The marker is a pipe,
 // the page the service's own.
 #include "kesto/trace.hpp"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The numbers of the public headers are those of the service.
 #include "client/ServiceOperations.h"
 #include "utility/MessageKinds.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A connection's beginning and end in the service, and the event with its duration.
 #include "support/ServiceHarness.h"
 #include "support/WatchedThread.h"

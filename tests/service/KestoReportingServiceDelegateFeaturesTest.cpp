@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Device-wide settings: how they are read, and which sessions get them.
 #include "support/EmittedCodes.h"
 #include "support/ServiceHarness.h"

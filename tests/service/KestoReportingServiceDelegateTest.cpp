@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The making of the service object, its defaults, and its answers to clients.
 #include "service/KestoReportingServiceDelegate.h"
 #include "support/ServiceHarness.h"

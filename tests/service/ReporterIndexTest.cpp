@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Finding a session over all clients, compared with its definition: a walk over the registry that stops at the first
 // client with the ID.
 #include "service/ReporterIndex.h"

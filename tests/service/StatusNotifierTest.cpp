@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service manager's line is renewed after changes, not too often, and never without one.
 #include "service/StatusNotifier.h"
 

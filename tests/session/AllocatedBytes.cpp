@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The linker makes the program call these functions in place of malloc and its like. They count the real sizes,
 // separately for each thread, so that other threads do not disturb the count. Operator new is the program's own, so
 // that it is counted as well.

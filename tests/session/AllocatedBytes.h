@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How much memory a thread has and has had at most, so that a test can check the memory that an object takes while it
 // is made.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which entries the reader gives, and that an unchanged entry is the same item as before.
 #include "session/EntryReader.h"
 

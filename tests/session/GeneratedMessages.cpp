@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Compiled once for all tests, because the library's templates take longer to compile than a test that uses them.
 #include "session/GeneratedMessages.h"
 

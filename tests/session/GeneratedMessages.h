@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Payloads that RapidCheck makes, both as players send them and as they should not: missing keys, values of every wrong
 // type, booleans sent as numbers, times that stand still, decrease, or are not times.
 #pragma once

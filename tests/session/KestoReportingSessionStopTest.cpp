@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The end of a run, step by step: volume events, file, summary event.
 #include "session/AllocatedBytes.h"
 #include "session/KestoReportingSession.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The summary file: its place, its name, its content, and the log line when it cannot be written.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"

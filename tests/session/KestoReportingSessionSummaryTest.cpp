@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The summary event: every value of every key, in one dictionary, and its way to the analytics service.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"

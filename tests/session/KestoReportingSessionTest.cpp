@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A session's life: its initial state, its growing configuration, and the beginning and end of a run.
 #include "session/KestoReportingSession.h"
 #include "foundation/cbor/Cbor.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The trace of a session: when it starts and stops, on which thread, and its results.
 #include "session/KestoReportingSession.h"
 #include "support/TestPlatform.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Volume events: which stretches of playing become events, their content, and their log lines.
 #include "session/AllocatedBytes.h"
 #include "session/GeneratedMessages.h"

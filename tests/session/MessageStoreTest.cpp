@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The message store against its definition: a list of identifiers and payloads, searched from the end for the last
 // message of a kind. And what hostile messages cost.
 #include "session/MessageStore.h"

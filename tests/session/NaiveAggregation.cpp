@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Lists of dictionaries, searched from the beginning each time.
 #include "session/NaiveAggregation.h"
 

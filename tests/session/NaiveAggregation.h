@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a session derives from its messages, written a second time: step by step on plain lists of dictionaries, however
 // slow, and without any code of the service's version.
 #pragma once

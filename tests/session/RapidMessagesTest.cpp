@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Bursts: which payloads are folded together, the place of the folded payload, and its content.
 #include "session/GeneratedMessages.h"
 #include "session/KestoReportingSession.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Neither one client nor one user nor all of them together may fill the device's memory with messages.
 #include "session/StorageBudget.h"
 

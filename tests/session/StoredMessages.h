@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Message stores made from plain payloads, and their content as plain dictionaries.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libprotobuf's generated class as the other side: each reads the other's bytes, with records and foreign fields from
 // RapidCheck; and the record refuses all broken bytes that libprotobuf refuses.
 #include "sinks/AudioIssueDetected.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The record alone: its bytes, its text, and its equality.
 #include "sinks/AudioIssueDetected.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The events of a message, and their names.
 #include "sinks/KestoReportingFennicBridge.h"
 #include "sinks/KestoReportingGimboUtility.h"

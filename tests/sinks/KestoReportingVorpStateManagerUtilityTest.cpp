@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // When a leaked haptics session is suspected, and the request for a snapshot.
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 #include "support/MessageKinds.h"

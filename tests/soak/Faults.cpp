@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A fault that changes files does so behind the service's back, as another program or a bad disk would.
 #include "soak/Faults.h"
 

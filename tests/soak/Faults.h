@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The faults: each does one thing to the service, to its store or to the system around them, while clients are at work.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each client keeps a window of unanswered messages; of each kind that the ledger tells apart, some are among them.
 #include "soak/Load.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Clients that send as fast as they get answers, through every fault: when the service goes, they come back.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sums are compared when the load has ended. What a fault leaves to be repaired is repaired when events come, so
 // some come until the sums hold.
 #include "soak/Rounds.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A round: some faults in random order under load, and then the sums of the ledger, which must hold.
 #pragma once
 

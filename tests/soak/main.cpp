@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Faults in random order on a real service, for as long as asked. The same seed gives the same faults in the same
 // order; what the service does at their moments is chance.
 //

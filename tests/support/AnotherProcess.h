@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runs a part of a test in another process, for what a process cannot take back: a limit, or privileges that it gave
 // up.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The drivers' channels as the sampler reads them now, for tests that take samples.
 #pragma once
 

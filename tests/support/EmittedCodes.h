@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The codes of the events that clients and sessions emit.
 #pragma once
 

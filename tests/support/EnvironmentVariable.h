@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A variable of the process's environment for one test: set, or unset, as long as this lives.
 #pragma once
 

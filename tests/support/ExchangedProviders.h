@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A platform like another except for a few providers: for tests and measurements that want some of them real, slow, or
 // watched.
 #pragma once

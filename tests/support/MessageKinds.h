@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The numbers of the kinds of messages that tests send: a kind is a category and a type.
 #pragma once
 

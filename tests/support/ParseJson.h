@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads JSON with a library that the service does not use for reading, as other programs do.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Failures show values as their text, not as their bytes.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How a failure shows a value.
 #include "support/PrintValues.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The threads of the process: their number, without those of a sanitizer, and the nice value of one of them.
 #pragma once
 

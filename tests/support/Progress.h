@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A state that threads share, and for which they can wait.
 #pragma once
 

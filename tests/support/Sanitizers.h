@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Skips tests that a sanitizer would make fail.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service is made as its entry point makes it, on fakes.
 #include "support/ServiceHarness.h"
 

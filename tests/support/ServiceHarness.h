@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A whole service on fakes, and clients that speak its protocol to it by number, through the adapter that a real
 // connection uses.
 //

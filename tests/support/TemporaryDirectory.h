@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A directory for one test, and its files; the destructor removes it with everything in it.
 #pragma once
 

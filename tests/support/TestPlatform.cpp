@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A separate file, so that the fakes are compiled once and not for every test that installs them.
 #include "support/TestPlatform.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The whole platform on fakes, installed as long as this object exists.
 #pragma once
 

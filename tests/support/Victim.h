@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A process that performs an action, and lives until a test kills it.
 #pragma once
 

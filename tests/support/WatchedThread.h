@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Threads as the kernel shows them, for tests of waiting: such a test goes on when a thread sleeps, and not after a
 // fixed time.
 #pragma once

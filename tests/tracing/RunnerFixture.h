@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A runner on fakes, with helper functions for its tests.
 #pragma once
 

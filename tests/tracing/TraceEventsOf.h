@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Short notations for events of a kernel trace.
 #pragma once
 

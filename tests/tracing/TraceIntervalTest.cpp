@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which events form intervals, and the log lines about the others.
 #include "tracing/TraceInterval.h"
 #include "support/TestPlatform.h"

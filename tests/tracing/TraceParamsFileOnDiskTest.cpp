@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client may name anything as its file: reading ends without waiting, with an empty record and a log line.
 #include "tracing/TraceParamsParser.h"
 

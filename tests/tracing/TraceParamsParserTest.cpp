@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Correct and wrong trace-parameters files, in both encodings: their content and the log lines.
 #include "tracing/TraceParamsParser.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The end of a runner's work: the results file, the log, and failures of the file.
 #include "tracing/RunnerFixture.h"
 

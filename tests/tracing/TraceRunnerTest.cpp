@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Running traces: their set-up, their events, and the order of the steps.
 #include "tracing/RunnerFixture.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Runners on real queues, with a kernel trace that delivers events on its own thread. While the threads work
 // at the same time, the results hold every interval that was delivered before the end. The thread sanitizer checks that
 // no two threads use the same data.

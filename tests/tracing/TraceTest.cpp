@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A trace and its measurements: arguments of single events, results by name, and the events in memory.
 #include "tracing/Trace.h"
 #include "support/TestPlatform.h"

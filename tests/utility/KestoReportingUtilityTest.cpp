@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The shared functions, each with common values and edge cases; two formulations of one function are compared with each
 // other.
 #include "utility/KestoReportingUtility.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Waiting for a flag that another thread sets. Only these tests of the folder take real time, and as little as
 // possible: they wait for threads, never for a fixed time.
 #include "support/TestPlatform.h"

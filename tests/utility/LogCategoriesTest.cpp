@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Readers of the log filter by these tags.
 #include "utility/LogCategories.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Clients and stored events use these numbers and names, so these tests pin every one.
 #include "utility/MessageKinds.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Devices and cycles as plain data, and the interface that reports changes of devices.
 //
 // Devices are PipeWire's sinks and sources. The server works in cycles: a driver, most often a device, wakes all nodes

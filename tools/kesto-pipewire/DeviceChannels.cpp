@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of the channels, and the conversion from PipeWire's events to their values.
 #include "kesto-pipewire/DeviceChannels.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Statistics of PipeWire's devices, published as reporting channels: the service reports at the end of every session
 // how they changed.
 //

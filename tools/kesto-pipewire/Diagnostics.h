@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The program's lines on standard error, which a service manager keeps.
 #pragma once
 

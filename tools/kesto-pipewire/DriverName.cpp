@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every user may write to the tree: links in it are not followed, and only this user's own entries are trusted.
 #include "kesto-pipewire/DriverName.h"
 

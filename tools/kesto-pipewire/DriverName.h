@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The name of the driver for a user's devices, and the reasons why publishing may fail.
 //
 // Every user of a system's service may publish, so every user has a driver: "pipewire-1000" is that of user 1000.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Watches the folder, because a missing file cannot be watched.
 #include "kesto-pipewire/FileWatch.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Waits without polling for a file to appear: so the program learns immediately that a lost server's socket is back.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Nodes, links and clients by their IDs. The state of a stream or device is computed from the links each time: there
 // are few links, and so the state is always consistent.
 #include "kesto-pipewire/Graph.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The part of PipeWire's object graph that concerns sound: streams, their applications and links, and devices.
 //
 // A node without a class is a filter, which is how JACK's programs look as well. Each direction in which it is linked

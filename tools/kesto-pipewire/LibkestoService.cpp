@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libkesto's callbacks come on its own thread: they store the state, and the loop's next turn reads it.
 #include "kesto-pipewire/LibkestoService.h"
 

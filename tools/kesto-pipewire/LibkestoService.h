@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The reporting service behind a connection: passes the reporter's calls to libkesto.
 //
 // libkesto connects again without help, but does not create sessions again. This class reports a new connection on the

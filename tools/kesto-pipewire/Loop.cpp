@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // PipeWire's loop calls back with a pointer. Its target lives until the callback has returned, even if the callback
 // destroys its own source.
 #include "kesto-pipewire/Loop.h"

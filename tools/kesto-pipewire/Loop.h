@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The one event loop of the program: PipeWire's own, so that its events, the program's timers and the system's signals
 // take turns on one thread and need no lock.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The uptime is that of CLOCK_BOOTTIME, which goes on while the device sleeps. CLOCK_MONOTONIC does not, so a time on
 // it only gives the time that has passed since.
 #include "kesto-pipewire/Moment.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time of an event, on the two clocks that reports need.
 #pragma once
 

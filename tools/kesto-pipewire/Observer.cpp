@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The loss of a server is noticed inside a callback of its connection, which must not destroy the connection: so the
 // callback notes the time of the loss, and the loop's next turn handles it.
 #include "kesto-pipewire/Observer.h"

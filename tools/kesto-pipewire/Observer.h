@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps a connection to PipeWire, across restarts of the server, and reports changes of its streams and devices.
 //
 // When the server goes, every stream goes with it, and the observer waits for the next server: the appearance of its

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A class for each kind of bound object: its listener decodes the object's events and passes them to the graph.
 #include "kesto-pipewire/PipeWireConnection.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One connection to a PipeWire server: its events, decoded and fed into a graph of streams.
 //
 // It only observes. It binds clients (for their identity), streams (for their state, volume and format), filters from

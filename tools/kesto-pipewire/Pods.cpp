@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A pod's type, size and number of elements are checked before its content is read, because clients of PipeWire write
 // these.
 #include "kesto-pipewire/Pods.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads PipeWire's binary values ("pods"): volumes, formats and cycles.
 #pragma once
 

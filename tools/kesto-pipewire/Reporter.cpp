@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Three independent steps: events become pending changes; pending changes become due; due changes are reported in the
 // order in which they happened.
 #include "kesto-pipewire/Reporter.h"

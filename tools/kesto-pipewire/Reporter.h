@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reports streams: one session for each stream, from its appearance to its end.
 //
 // PipeWire reports every step, the reporter only changes that a listener would notice. When a device is plugged in,

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The reporting service as the reporter sees it: the operations on one session.
 //
 // An interface, so that the reporter can be tested without a service.

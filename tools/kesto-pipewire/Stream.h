@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A stream as plain data, and the interface that reports changes of streams.
 //
 // A stream is one player's or recorder's connection to PipeWire, or one direction of a filter's. These types separate

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The text is cut first, so that a character which the cut halves becomes "?" as well.
 #include "kesto-pipewire/ValidText.h"
 

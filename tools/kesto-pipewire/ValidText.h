@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes foreign text valid for sending: any program chooses its names, and the reporting service ends a connection that
 // sends text that is not UTF-8.
 #pragma once

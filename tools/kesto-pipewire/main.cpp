@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // kesto-pipewire: reports every stream of a running PipeWire to the reporting service, so that players stay unchanged.
 //
 // This file connects the parts: the observer of PipeWire; the reporter, which decides what to report; the connection to

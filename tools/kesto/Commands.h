@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The subcommands of `kesto`, one in each file. The chosen one runs after the command line was parsed and sets the exit
 // status.
 #pragma once

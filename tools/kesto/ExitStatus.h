@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How the tool ends; 2 is a wrong command line. `kesto status` has some of its own.
 #pragma once
 

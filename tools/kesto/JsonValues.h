@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What is not known is null in the JSON of each command.
 #pragma once
 

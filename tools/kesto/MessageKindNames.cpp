@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The vocabulary only maps numbers to names, so these functions try every number that has a name.
 #include "kesto/MessageKindNames.h"
 

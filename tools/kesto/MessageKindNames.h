@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Categories, event types and service types by their names, as people write them.
 #pragma once
 

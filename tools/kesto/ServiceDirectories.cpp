@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One rule for all directories: only their names differ.
 #include "kesto/ServiceDirectories.h"
 

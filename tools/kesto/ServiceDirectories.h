@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The default directories of the service. The environment comes first, with systemd's names, as for the service itself;
 // then the user's own directories, if the user has a service; then the system's.
 #pragma once

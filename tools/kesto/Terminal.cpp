@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Characters are counted by their first bytes in UTF-8, even if the other bytes are wrong.
 #include "kesto/Terminal.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Text for a person at a terminal: control characters are replaced, and lines are cut to its width. Every character
 // counts as one column.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // kesto: lets a person call the service and read its results.
 #include "kesto/Commands.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // tone-player: a player for tests and demonstrations, because common players cannot be paused from a script.
 //
 //   tone-player [ROLE [NAME]]

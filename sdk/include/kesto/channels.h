@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libkesto for C, publishing: counters, histograms and states of a driver, for the Kesto reporting service (kestod),
 // which reports at the end of each session how they changed.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libkesto for C: reports a program's use of audio to the Kesto reporting service (kestod).
 //
 // A client is one connection. Everything on it is asynchronous: a call puts work into the client's queue and

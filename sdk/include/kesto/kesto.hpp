@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libkesto for C++: reports a program's use of audio to the Kesto reporting service (kestod).
 //
 //     kesto::Client client;

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libkesto for C, playbacks and recordings: a program says what it plays, and the library makes the session and its
 // messages, so that the service (kestod) knows how long it played, at which volume, on which device.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // libkesto for C++, tracing: events of a program in the kernel's trace, for sessions of the Kesto reporting service
 // (kestod) that measure the time between them.
 //

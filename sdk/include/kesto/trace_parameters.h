@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The keys and values of trace-parameters files, for programs in C and C++ that write them: property lists that name
 // the events of the kernel's trace that begin and end each measurement of a session of the Kesto reporting service
 // (docs/tracing.md).

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """libkesto for Python: reports a program's use of audio to the Kesto reporting service (kestod).
 
     with kesto.Client(reconnect=True) as client, kesto.Playback(

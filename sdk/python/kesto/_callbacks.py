@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Callbacks: how a function of Python is called by the library, and how long it lives.
 
 The library gets no pointer to an object of Python. It gets a number, which stands for the function in a table until the

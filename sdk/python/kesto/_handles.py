@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Handles: who owns an object of the library, and when it is freed.
 
 A handle is freed when the last reference to it goes. A call holds a reference while it is under way, so no thread can

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """libkesto as the C interface describes it: the structures, the functions with their types, and finding the library.
 
 Nothing is loaded when the package is imported: the first call loads `libkesto.so.0`, or what $KESTO_LIBRARY names.

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Messages: a dictionary of Python becomes a message of the library.
 
 A float of Python is a double. The library's 32-bit floats have no type here: they are for programs that have such

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """What a client tells: answers, changes of its state, and counts. Plain data, which the program may keep."""
 
 import dataclasses

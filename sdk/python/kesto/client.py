@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The client: a connection to the service, with every operation."""
 
 import ctypes

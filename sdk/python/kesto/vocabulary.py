@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The names and numbers of the interface: what calls return, what sessions and messages are about, and the error that a
 refused call raises.
 

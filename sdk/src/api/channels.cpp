@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Implements channels.h with the classes of the library: checks callers' arguments, and lets no exception out.
 #include "kesto/channels.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the interface: the functions of the public headers, on top of the classes of the other rooms. It adds
 // only checks of what callers pass.
 //

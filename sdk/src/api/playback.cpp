@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Implements playback.h with the classes of the library: a null stream is one of a closed client, and no exception gets
 // out.
 #include "kesto/playback.h"

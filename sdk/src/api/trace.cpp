@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Implements trace.h with the classes of the library.
 #include "kesto/trace.h"
 

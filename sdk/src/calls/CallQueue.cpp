@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Callers claim room at one end, and the reader frees it at the other; both positions are numbers that only grow. Where
 // a record would cross the end of the ring, a filler takes its place.
 #include "calls/CallQueue.h"

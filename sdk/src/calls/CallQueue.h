@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The queue from any number of calling threads to the one thread of a client: a bounded ring of bytes.
 //
 // It is made for callers that must not wait. Pushing is one compare-and-swap that claims room, a copy, and one store

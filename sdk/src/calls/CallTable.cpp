@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The answers that a start can still get depend on its session's state, so the table follows that state like the
 // service.
 #include "calls/CallTable.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The calls that wait for answers, and how many answers each can still get.
 //
 // Nearly all calls get one answer. Asking for the service type of reporter 0 gets two. A start is answered when its run

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The checks before a message is taken, and the order in which a client ends.
 #include "calls/Client.h"
 

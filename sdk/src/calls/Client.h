@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of calls: from a caller's function to a sent frame, and from an answer to the caller's callback. It has one
 // thread for each client.
 //

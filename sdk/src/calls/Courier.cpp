@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One loop: it takes the callers' calls, sends them, sleeps, and hands out the answers.
 #include "calls/Courier.h"
 

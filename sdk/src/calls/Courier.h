@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The client's thread: takes calls from the mailbox, sends them, hands out the answers and, if the caller wants that,
 // connects again after a connection has ended.
 //

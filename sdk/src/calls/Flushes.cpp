@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A flush waits until the queue has been read up to its position, and then until all calls up to there are answered.
 #include "calls/Flushes.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Callers that wait until their calls are answered.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The order of claiming room and ringing.
 #include "calls/Mailbox.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The queue between callers and the client's thread, and how callers wake that thread. It keeps the promise that `send`
 // makes no system call while a session is started.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Arguments are checked here and not by the client's thread, so that the caller learns at once that they are wrong.
 #include "calls/StreamHandle.h"
 

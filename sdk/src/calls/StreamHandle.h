@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the owner of a playback or a recording holds: its calls, which become records in the client's queue.
 #pragma once
 

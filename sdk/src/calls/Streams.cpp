@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Entries never move, so a record may hold the address of its stream.
 #include "calls/Streams.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The playbacks and recordings of a client, from their creation until the client's thread has let them go.
 //
 // Their state belongs to the client's thread: callers only put records into the queue. A lock guards the list itself,

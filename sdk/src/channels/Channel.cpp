@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Changing a channel takes no lock. Only one thread at a time makes its text, from the values that it sees.
 #include "channels/Channel.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The value of a channel, which any thread may change at any time, and the text of its file.
 //
 // Values are atomic and independent: threads never wait for each other. A reader may see a value that is a moment old,

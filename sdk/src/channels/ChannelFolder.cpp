@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Folders are made and opened one by one, from the root on; a file is written beside its place and then renamed.
 #include "channels/ChannelFolder.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The publisher's side of the channel tree: it makes missing folders, opens them step by step and never through a link,
 // and puts complete files into them.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The files of dead publishers are found by a search through the driver's folders, because no list of them exists.
 #include "channels/DriverClaim.h"
 

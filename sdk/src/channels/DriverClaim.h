@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A publisher's claim to its files below one driver: an owner file with a lock that shows that the publisher lives.
 //
 // A publisher that claims a driver removes the files of this user's dead publishers there: channels, unfinished files

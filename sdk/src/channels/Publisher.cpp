@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One lock protects the list of channels and their files. Changes of values never take it: they use the channel's own
 // mark and the bell.
 #include "channels/Publisher.h"

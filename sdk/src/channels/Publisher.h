@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of channels: the values that a program publishes, and their files. It writes below the root of channels,
 // with one thread for each publisher, and uses no connection.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each change first changes the state and then reports it. So a record that is followed again, because reporting it
 // failed, finds nothing to change.
 #include "streams/Stream.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of streams: what a program plays or records, from its calls to the calls of a session. It has no threads and
 // no connection.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A call of a playback or a recording as it stands in the client's queue.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The shape of a call is known, so its frame is written directly from the caller's data, without values in between.
 #include "wire/CallFrames.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The content of the connection: calls become frames, and frames become answers. It uses no sockets.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A head is written before its number is known, and widened in the rare case that one byte is too small.
 #include "wire/MessageEncoder.h"
 

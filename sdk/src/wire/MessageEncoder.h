@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Encodes the entries of a message as CBOR while they are added, so that sending them is only a copy.
 //
 // The head of a container holds the number of its entries, which is known only at its end. One byte stands in for it

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The socket never blocks: bytes that it does not accept wait here.
 #include "wire/ServiceConnection.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the wire: the service's path, the socket, and the frames that it carries. It has no threads and does not
 // know which calls wait for answers.
 //

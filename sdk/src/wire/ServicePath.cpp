@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The environment comes first, then the usual places of the packaged service.
 #include "wire/ServicePath.h"
 

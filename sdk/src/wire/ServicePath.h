@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where the service's socket is.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Only the few items of CBOR that two keys, a double and a number of seconds take. The encoder of messages appends to a
 // string, which would allocate.
 #include "wire/Stamps.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time stamps that the library adds to a message, as encoded entries.
 //
 // They are written into memory of the object itself: a real-time thread makes them at each send.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The writer is a head and the bytes behind it. The reader is one pass over foreign bytes, without look-ahead: it
 // recurses only into containers, which are counted, and trusts no length before the bytes are there.
 #include "foundation/cbor/Cbor.h"

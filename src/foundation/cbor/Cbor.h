@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of CBOR: values as bytes and bytes as values. It reads from memory, and knows of no connection.
 //
 // Values as CBOR (RFC 8949): the format of the wire, and the compact form in which a session keeps its messages.

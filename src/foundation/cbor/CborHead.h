@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The head of every CBOR item: the kind of the item, and one number. For the readers and writers of this folder.
 #pragma once
 

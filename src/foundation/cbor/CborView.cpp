@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The slower functions: sizes of containers, and values that have to be built.
 #include "foundation/cbor/CborView.h"
 

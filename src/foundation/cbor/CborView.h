@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Looking into encoded values without decoding them.
 //
 // A session keeps its messages encoded, and its results need a few keys of each of a million messages. Walking over the

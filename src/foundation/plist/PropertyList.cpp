@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Recognises the form; each form has a reader of its own. XML in UTF-16 becomes UTF-8 before it is read.
 #include "foundation/plist/PropertyList.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of property lists: their text and binary forms as values. It reads from memory, and opens no file.
 //
 // Property lists: the files in which people and programs describe things as dictionaries of dictionaries, written as

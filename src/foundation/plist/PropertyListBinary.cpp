@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The binary form: objects in any order, a table of where each begins, and at the end a trailer that says where the
 // table is. Containers name their elements by their numbers in the table.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The common part of the readers of both forms, only for them: the first failure ends the reading, the objects are
 // counted, and characters become UTF-8.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The XML form. pugixml cuts the document into elements and texts; this file interprets them.
 //
 // pugixml skips the document type without reading it, and leaves references as they are: this file resolves XML's own

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of protocol buffers: reading, writing and showing their records. It reads from memory, and opens no file.
 //
 // The operations of every protocol-buffers record: reading, writing and formatting.

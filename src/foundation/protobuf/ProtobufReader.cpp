@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each step takes something from the front and returns whether it was complete. The first step that fails empties the
 // rest, so that every loop ends.
 #include "foundation/protobuf/ProtobufReader.h"

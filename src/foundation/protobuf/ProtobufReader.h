@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading the wire format of protocol buffers, in which a message is a row of fields: a number, a wire type, and a
 // value with a length that the wire type determines.
 //

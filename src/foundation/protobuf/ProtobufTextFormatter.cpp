@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Text is escaped so that the protocol's own parser reads back the same bytes.
 #include "foundation/protobuf/ProtobufTextFormatter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Messages of protocol buffers as text for people, in the text format that the protocol's own tools write and read:
 // each field is a line, and objects are indented, in braces.
 #pragma once

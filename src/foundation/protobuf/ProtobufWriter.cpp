@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A field is its tag and then its value: the writer appends both in one step on the string.
 #include "foundation/protobuf/ProtobufWriter.h"
 

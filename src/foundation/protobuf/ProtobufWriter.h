@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writing the wire format of protocol buffers: field by field, each appended to the bytes of the message.
 #pragma once
 

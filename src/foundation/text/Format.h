@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of text: how numbers, times and values become text for people, and how long text is put together. Only local
 // time depends on the system: on its time zone.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time zone is read each time, because a device travels while the service runs.
 #include "foundation/text/LocalTime.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Local time as text, for names and tables that people read.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The standard library rounds the exact binary value half to even; this file only drops zeros.
 #include "foundation/text/NumberFormatter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decimal text of a number with a bounded count of fraction digits, for people and for bucket names.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // RapidJSON indents; this file collects the text and passes it on in large pieces.
 #include "foundation/text/PrettyJsonWriter.h"
 

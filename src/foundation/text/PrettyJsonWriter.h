@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // JSON for people, written piece by piece: indented, each member on its own line, and never in memory as a whole.
 #pragma once
 

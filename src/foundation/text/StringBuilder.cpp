@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Memory doubles while the string grows, and is cut to size when it is finished.
 #include "foundation/text/StringBuilder.h"
 

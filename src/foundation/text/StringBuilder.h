@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A string in the making, which may become very long.
 //
 // The string's own memory grows, by `realloc`: the system moves the pages of a large text instead of copying it, and

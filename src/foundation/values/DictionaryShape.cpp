@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Up to a few keys, comparing them one by one beats any index; beyond, they are sorted.
 #include "foundation/values/DictionaryShape.h"
 

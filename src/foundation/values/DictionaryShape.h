@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The keys of dictionaries, in their order: what language runtimes call a shape.
 //
 // The messages of a player have the same keys in the same order, time after time. Dictionaries that share one shape are

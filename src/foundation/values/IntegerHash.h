@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A hash of integers that clients choose, such as IDs. The standard hash is the number itself, so a client could choose
 // numbers that fall into one bucket, and every look-up would be as slow as in a list. This hash mixes them with a
 // number that the process draws at its start, which no client can know.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The compact form, in one piece.
 #include "foundation/values/Json.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Values as JSON text (RFC 8259), for the store, the tools, and the text of arrays and dictionaries.
 //
 // Numbers are written by `Number::text`, so that a float of 32 bits stays short (0.6, not

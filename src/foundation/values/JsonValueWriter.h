@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How values become JSON, for the writers of this folder: RapidJSON escapes text and keeps commas and indents,
 // numbers come from `Number`, data and dates from `Value`.
 //

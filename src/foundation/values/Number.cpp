@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Conversions that never leave the range of their result, and exact equality, which does not compare an integer by way
 // of a double that cannot hold it.
 #include "foundation/values/Number.h"

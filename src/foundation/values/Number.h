@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A number that keeps its kind, and compares by its value.
 //
 // Clients send booleans, integers and floats of two widths. The kind decides how a number is written; the value alone

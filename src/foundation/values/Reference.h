@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Shared ownership of immutable objects, one pointer wide.
 //
 // Strings, arrays and dictionaries are shared by every value that holds them: copying a value is

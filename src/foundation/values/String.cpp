@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One allocation for each string, and none for the empty one; UTF-8 is checked eight characters at a time.
 #include "foundation/values/String.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Immutable shared text; and data, which need not be text.
 //
 // A string has an identity besides its characters: a copy is the same object, but a new string of equal characters is

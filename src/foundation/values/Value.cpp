@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How values are shared, found, compared and converted.
 //
 // Empty strings, arrays and dictionaries have no object: a frame of a million empty arrays, which a hostile

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of values: numbers, texts, arrays and dictionaries, how they compare, and their JSON text. It uses no other
 // room.
 //

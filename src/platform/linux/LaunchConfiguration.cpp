@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every variable is read, even after a problem, and the first problem is kept: so the checks read as a list.
 #include "platform/linux/LaunchConfiguration.h"
 

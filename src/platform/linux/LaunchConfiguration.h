@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The launch configuration of the process: environment variables, with systemd's own names where it has them, so that a
 // unit file sets everything.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The few connections between otherwise independent providers: which preferences post which notification, and what
 // happens at the end of a turn.
 #include "platform/linux/LinuxPlatform.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All providers of this system, declared so that the queues end first: what a queue still runs finds every other
 // provider. Providers that are made before the queues only keep a reference to them while they are made.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All errors of foreign bytes; none of them costs more than it may.
 #include "foundation/cbor/Cbor.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Written values are read back unchanged; and heads that callers write by hand match those of values.
 #include "foundation/cbor/Cbor.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All examples of RFC 8949, appendix A: those that a `Value` can express are read and written; other encodings of the
 // same values are read; the others must be refused.
 #include "foundation/cbor/Cbor.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Views of encoded values compared with decoded values.
 #include "foundation/cbor/CborView.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Another implementation as the other side: libcbor reads the encoder's bytes, and the decoder reads libcbor's.
 #include "foundation/cbor/Cbor.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Bytes as the hexadecimal text in which standards and people write them down.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All errors of property lists and their texts; none of them costs more than it may.
 #include "foundation/plist/PropertyList.h"
 

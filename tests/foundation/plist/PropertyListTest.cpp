@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The values of property lists in both forms.
 #include "foundation/plist/PropertyList.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes property lists in both forms as other programs do, for tests of the readers; and malformed binary ones, from
 // parts that are given byte for byte.
 #pragma once

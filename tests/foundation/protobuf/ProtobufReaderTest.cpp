@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The wire format by hand: every wire type, all errors, and no reading beyond the last byte.
 #include "foundation/protobuf/ProtobufReader.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The written bytes, and the text.
 #include "foundation/protobuf/ProtobufWriter.h"
 #include "foundation/protobuf/ProtobufTextFormatter.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Local time: zones with odd offsets, summer and winter, a device that travels, and moments that no calendar can
 // express.
 #include "foundation/text/LocalTime.h"

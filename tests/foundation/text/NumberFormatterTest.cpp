@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decimal text as people read it in bucket names.
 #include "foundation/text/NumberFormatter.h"
 

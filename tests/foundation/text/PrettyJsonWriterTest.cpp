@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Pretty JSON against RapidJSON's own pretty writer, byte by byte.
 #include "foundation/text/PrettyJsonWriter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Text that grows piece by piece, compared with plain concatenation, also where memory is reallocated.
 #include "foundation/text/StringBuilder.h"
 

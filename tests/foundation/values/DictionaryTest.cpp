@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Dictionaries compared with their simplest form: a list of pairs that is searched from the front.
 #include "foundation/values/GeneratedValues.h"
 #include "foundation/values/Value.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Values that RapidCheck makes: of every kind, nested, with keys that repeat and text of all lengths of UTF-8.
 #pragma once
 

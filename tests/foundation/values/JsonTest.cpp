@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // JSON text in the form of the store and the tools.
 #include "foundation/values/Json.h"
 

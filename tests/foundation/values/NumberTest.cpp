@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Numbers of every kind, at the limits where a careless comparison or conversion is wrong.
 #include "foundation/values/Number.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The identity of strings, and the table of UTF-8.
 #include "foundation/values/String.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kinds of values, their conversions, and the sharing of copies.
 #include "foundation/values/Value.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/Analytics.h: wanted events are kept, in order, with payloads that are built once; other
 // events are dropped completely.
 #include "platform/contract/Contract.h"

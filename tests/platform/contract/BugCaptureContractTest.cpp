@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/BugCapture.h: the content of a signature, the data that a caller passes with a request, and
 // the time of the answer.
 #include "platform/contract/Contract.h"

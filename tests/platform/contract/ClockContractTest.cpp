@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/Clock.h: a time of day, and an uptime that never decreases.
 #include "platform/contract/Contract.h"
 #include "platform/linux/process/LinuxClock.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/Connection.h: the order of calls and ends, the lifetimes of handlers and callers, the time
 // at which answers leave, and late answers.
 #include "platform/contract/Contract.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The common part of the contracts. A contract is a suite of tests that is written once, for an interface of
 // src/platform, and runs on the fake and on the provider of Linux: a failure is a defect of that provider, or of the
 // interface's comments.

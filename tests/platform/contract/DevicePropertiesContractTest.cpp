@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/DeviceProperties.h: a property is true, false, or missing.
 #include "platform/contract/Contract.h"
 #include "platform/linux/settings/LinuxDeviceSettings.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/linux/store/EventKeeper.h: kept events stay in their order, and those that are too old or
 // too many are removed.
 #include "platform/contract/Contract.h"

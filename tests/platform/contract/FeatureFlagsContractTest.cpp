@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/FeatureFlags.h: a flag is on only if its owner has switched it on.
 #include "platform/contract/Contract.h"
 #include "platform/linux/settings/LinuxDeviceSettings.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/FileSystem.h: folders with their permissions, files that are complete or missing, and the
 // errors of files that cannot be written or read.
 #include "platform/contract/Contract.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/KernelTrace.h: the events of a session, its completion, and its end.
 //
 // The provider of Linux is tested twice: on an imitation of tracefs, everywhere, and on the kernel itself where this

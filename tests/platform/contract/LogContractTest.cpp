@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/Log.h for a log: a threshold for each category, and complete lines from any thread.
 #include "platform/contract/Contract.h"
 #include "platform/linux/files/FileDescriptor.h"

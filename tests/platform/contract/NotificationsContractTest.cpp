@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/Notifications.h: a post of a name calls its handlers on their queues, and they can read the
 // posted state.
 #include "platform/contract/Contract.h"

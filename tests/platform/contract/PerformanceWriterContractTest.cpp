@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/PerformanceWriter.h: the content of a closed file, and places where opening fails.
 #include "platform/contract/Contract.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/Preferences.h: the stored values by domain and key.
 #include "platform/contract/Contract.h"
 #include "platform/linux/settings/LinuxPreferences.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/ProcessTable.h: processes by number, with the kernel's names for them.
 #include "platform/contract/Contract.h"
 #include "platform/linux/NamedProcess.h"

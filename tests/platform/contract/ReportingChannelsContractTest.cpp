@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/ReportingChannels.h: finding channels, samples, and differences of two samples.
 #include "platform/contract/Contract.h"
 #include "platform/linux/channels/LinuxReportingChannels.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/TraceEmitter.h: each call of `emit` is one event of the trace, and does nothing without a
 // trace.
 #include "platform/contract/Contract.h"

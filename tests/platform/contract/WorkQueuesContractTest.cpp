@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The contract of platform/WorkQueue.h: the order of items, their threads, and waiting.
 #include "platform/contract/Contract.h"
 #include "platform/linux/NoThreads.h"

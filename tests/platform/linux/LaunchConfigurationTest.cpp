@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every wrong configuration has its own error line; and the exchange with the service manager.
 #include "platform/linux/LaunchConfiguration.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The providers together: each is made from the launch configuration, and their connections work.
 #include "platform/linux/LinuxPlatform.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A real process for tests that look up processes.
 #pragma once
 

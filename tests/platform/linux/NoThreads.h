@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A process that gets no more threads as long as this object exists: each would have a stack larger than all memory.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The queue between a program's threads and the client's thread: order, room and limits, against a model, and with many
 // threads at the same time.
 #include "calls/CallQueue.h"

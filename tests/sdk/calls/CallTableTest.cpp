@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which answer belongs to which call: calls that are answered once, twice, late or never, and answers that no honest
 // service would send.
 #include "calls/CallTable.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client and a service on a real socket: every operation, its answers, and the ends that a client can have.
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"

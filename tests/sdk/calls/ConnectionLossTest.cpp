@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What happens to calls, sessions and clients if the service goes, never existed, or sends nonsense.
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"

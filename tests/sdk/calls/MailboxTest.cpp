@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which calls ring, and when: the promise that sending makes no system call while a session is started.
 #include "calls/Mailbox.h"
 

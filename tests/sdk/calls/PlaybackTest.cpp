@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Playbacks and recordings of a client with a service on a real socket: what comes of their calls, what becomes of them
 // when the queue is full, the service goes or the client ends, and that they are safe in a real-time thread.
 #include "kesto/playback.hpp"

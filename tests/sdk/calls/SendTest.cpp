@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The promises of `send`: counts, limits, many threads, no allocation, no system call. The last is also one of the
 // calls of playbacks.
 #include "kesto/kesto.hpp"

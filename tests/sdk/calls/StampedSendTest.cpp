@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The times that `send` adds to messages, as they come to the service.
 #include "kesto/kesto.hpp"
 #include "sdk/FakeService.h"

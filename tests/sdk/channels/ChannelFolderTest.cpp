@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The default place of channels.
 #include "channels/ChannelFolder.h"
 

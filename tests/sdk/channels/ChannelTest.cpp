@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The values of channels, and the content of their files.
 #include "channels/Channel.h"
 

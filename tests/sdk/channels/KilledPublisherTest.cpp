@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The files of a killed publisher: the service ignores them, and the next publisher removes them.
 #include "kesto/channels.hpp"
 #include "platform/linux/channels/ChannelTree.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Publishing through the C++ interface, checked with the service's own reader of the tree.
 #include "kesto/channels.hpp"
 #include "platform/linux/channels/ChannelTree.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The package for Python with a real service: what its documents show and what its example reports of a player become
 // stored seconds, volumes and devices. Clocks move only when a program sleeps.
 #include "sdk/PlayTimes.h"

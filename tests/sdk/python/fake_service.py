@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The other end of the wire, in the test's own process: reads calls from a real socket, records them, and answers as
 kestod does, as far as one client can tell. A service that `holds` answers nothing until it is asked to.
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """How long the library keeps what it may call, and what it calls it with."""
 
 import gc

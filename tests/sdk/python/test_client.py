@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The client: its calls and their answers, its states, and its end."""
 
 import ctypes

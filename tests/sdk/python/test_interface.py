@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """The package describes the interface as the compiler sees it in the headers: the places of all fields, the types of
 all functions, and all numbers.
 

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Finding the library: importing loads nothing, and a library that cannot be used is one clear error."""
 
 import os

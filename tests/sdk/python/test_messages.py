@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Every kind of value, as the service gets it."""
 
 import collections

@@ -1,3 +1,4 @@
+# SPDX-License-Identifier: Apache-2.0
 """Playbacks and recordings: their calls, as the messages that the service gets, and their end."""
 
 import gc

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a playback and a recording make of their owner's calls, at moments of the test's choosing.
 #include "streams/Stream.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where a client looks for the service: the option comes before the environment, and the environment before the usual
 // places of the packaged service.
 #include "wire/ServicePath.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The wire's own decoder reads the stamps, which must have the shortest encoding.
 #include "wire/Stamps.h"
 

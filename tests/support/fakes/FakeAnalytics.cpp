@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Payloads are built only when a test asks for them, because the test decides whether they are needed.
 #include "support/fakes/FakeAnalytics.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // An analytics service that keeps the sent events. It is as lazy as a service may be: it builds a payload only when the
 // test reads it. It drops unwanted events immediately.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A bug-capture service that keeps the requests for snapshots, and answers when the test says so.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A clock that stands still until a test moves it.
 #pragma once
 

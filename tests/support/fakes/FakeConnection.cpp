@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Expectations check the rules that a real connection keeps: no call before reading begins, none after the end.
 #include "support/fakes/FakeConnection.h"
 

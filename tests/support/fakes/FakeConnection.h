@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A connection without a socket, seen from the client's side: the test makes calls, reads the answers, and ends the
 // connection in any of several ways.
 //

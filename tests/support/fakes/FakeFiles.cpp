@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Refuses what a disk refuses: a file without a folder, a folder in place of a file, and paths that lead out of the
 // root.
 #include "support/fakes/FakeFiles.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files in a test's memory: those of the file system and those of the performance-data writer.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Records the calls of each session; a test delivers events and completes sessions.
 #include "support/fakes/FakeKernelTrace.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A kernel trace with events that the test makes.
 #pragma once
 

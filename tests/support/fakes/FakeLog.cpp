@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps lines in their order; a failing test shows them in full.
 #include "support/fakes/FakeLog.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A log that keeps its lines, so that tests can check their text, level and order.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Counts the freed bytes and the clients that the service reports, and has the limits that a test sets.
 #pragma once
 

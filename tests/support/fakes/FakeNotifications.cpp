@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Handlers run on the queue of their registration, as with the real provider, and as rarely as the contract allows.
 #include "support/fakes/FakeNotifications.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // System notifications that a test posts, with states that it sets.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A sample is a copy of the channels at that moment; a difference is computed as by the real platform.
 #include "support/fakes/FakeReportingChannels.h"
 

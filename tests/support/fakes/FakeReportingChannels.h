@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reporting channels that a test publishes and changes, with failures that it chooses.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The fake channels fail as a test chooses.
 #include "support/fakes/FakeReportingChannels.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A process's name is cut and cleaned as by the kernel and the real provider.
 #include "support/fakes/FakeSettings.h"
 

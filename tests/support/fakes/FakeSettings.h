@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The facts and settings of a device, as a test sets them: preferences, feature flags, device properties and the
 // process table.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps trace events in the order in which they were emitted.
 #pragma once
 

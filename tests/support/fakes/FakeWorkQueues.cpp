@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Items wait until a test runs them, in the order of submission over all queues; a serial queue never runs two items at
 // once, and the background queue at most as many as it has threads.
 #include "support/fakes/FakeWorkQueues.h"

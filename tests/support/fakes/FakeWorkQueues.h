@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Work queues without threads: everything runs on the test's own thread when the test says so. Items run in the order
 // in which they were submitted, and delayed work when virtual time reaches it.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The fake work queues behave like real ones.
 #include "support/fakes/FakeWorkQueues.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each session is lived through from its beginning to its end, and leaves stretches, faults and messages on its way.
 // What would lie behind the present is cut off.
 #include "support/weeks/MadeUpWeeks.h"

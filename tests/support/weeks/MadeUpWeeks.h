@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Weeks of playing and recording that nobody heard: made up from a seed, told as the service would have kept them, with
 // the truth beside them. A reader of the event store can then be held against what is known to have happened.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Messages and the stretches that they end share one sequence of IDs, as the service gives them out.
 #include "support/weeks/WeeksFile.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Made-up weeks as a file of the event store, in the tables that the service itself makes.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The channels of devices, as their files show them.
 
 #include "kesto-pipewire/DeviceChannels.h"

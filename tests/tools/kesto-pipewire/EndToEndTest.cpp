@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The whole path: a sound that plays on a real PipeWire, the shipped program, a real service, and its stored events.
 
 #include "support/Sanitizers.h"

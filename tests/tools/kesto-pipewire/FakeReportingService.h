@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A reporting service that only records its calls.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The graph of streams, with every order of events that a server may send.
 
 #include "kesto-pipewire/Graph.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The headless-pipewire script does the work; this file starts and ends it.
 #include "tools/kesto-pipewire/HeadlessPipeWire.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A real PipeWire of a test's own, and programs that play and record on it.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The observer's reports of real streams on a real PipeWire without hardware.
 
 #include "kesto-pipewire/Observer.h"

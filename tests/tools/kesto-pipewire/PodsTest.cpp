@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading PipeWire's values: values as a server builds them, and malformed ones.
 
 #include "kesto-pipewire/Pods.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A listener that records the events of devices as lines of text, and their cycles unchanged.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A listener that records the events of streams as lines of text.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The reports about streams, with streams and a clock that only exist in these tests.
 
 #include "kesto-pipewire/Reporter.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // tone-filter: a program for tests that plays or records as JACK's programs do: PipeWire links its ports only as it is
 // asked to, and its node has no class.
 //

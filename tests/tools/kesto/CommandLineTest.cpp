@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The command line itself: help, version, its errors, and output that cannot be written.
 #include "tools/kesto/Tool.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The completions that bash offers.
 #include "tools/kesto/Tool.h"
 

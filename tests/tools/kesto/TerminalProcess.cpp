@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The program is the leader of a session with this terminal, as a shell's is.
 #include "tools/kesto/TerminalProcess.h"
 

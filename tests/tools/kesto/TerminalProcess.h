@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A program on a terminal of its own, whose other end is the test: it types, reads, and sees the terminal's modes.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The text for a terminal, and its width.
 #include "kesto/Terminal.h"
 #include "support/EnvironmentVariable.h"

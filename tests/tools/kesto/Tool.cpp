@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The tool inherits the test's environment, without variables that would lead it to a service of this machine.
 #include "tools/kesto/Tool.h"
 

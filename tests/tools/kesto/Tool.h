@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The tool as it is shipped, in an environment of its own that names the directories of one service.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of the operations says which arguments each takes, in order. The arguments are read one by one, up to the
 // first wrong one. The tool's own table adds the name that a person uses for an operation, and the function to call.
 #include "kesto/client/ClientCall.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One line of `kesto client`: a JSON array that names an operation and its arguments.
 #pragma once
 

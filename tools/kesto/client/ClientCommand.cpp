@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the client: the one command that calls the service. It connects to the service's socket.
 //
 // `kesto client`: every operation of the service from a shell. It reads one JSON array in each line, and prints one

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The new file is completely on the disk before it gets the name, so that a loss of power leaves the old or the new
 // file.
 #include "kesto/files/FileReplacement.h"

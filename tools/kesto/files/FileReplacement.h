@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files that are replaced as a whole. Each is written beside its place and then moved, so that the service, or whoever
 // else reads it, never sees an unfinished file.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All errors of reading have one form.
 #include "kesto/files/InputFile.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of files: reading the files that commands show, and writing those that they make. It does not know what the
 // files mean.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // RapidJSON reports each piece and keeps none: this file builds the values, without recursion, so that it can refuse a
 // text of any depth.
 #include "kesto/files/JsonReader.h"

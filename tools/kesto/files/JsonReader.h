@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads JSON as values one after the other, so that only one element of a long list is in memory.
 #pragma once
 

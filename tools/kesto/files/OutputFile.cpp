@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file that is replaced as a whole is the business of FileReplacement; here is found which file that is.
 #include "kesto/files/OutputFile.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files that commands write to places that the user names.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rows are read in the order of their IDs, and chosen here: all of a small store are read in the time that a person
 // does not notice, and of a large one the sessions lie beside each other.
 #include "kesto/history/History.h"

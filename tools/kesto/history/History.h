@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the history: what was played and recorded, and where it went wrong, as the event store has it.
 //
 // It is read in one short transaction and then plain data: whoever draws or counts no longer holds the database.

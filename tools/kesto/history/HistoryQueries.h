@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a history asks the database. ?1 is the end of the span and ?2 its beginning, or the first and the last session;
 // ?3 is the only session that is asked for, or null.
 #pragma once

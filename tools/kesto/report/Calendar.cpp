@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The clock on the wall is the moment plus the zone's difference from UTC, which changes at some moments. The library's
 // way back from the clock to the moment (mktime) leaves open what it does with a time that is shown twice or never, so
 // only the way forth is used.

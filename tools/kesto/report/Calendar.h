@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The days of the reader, by the clock on the wall: a day begins when the clock shows its beginning for the first time,
 // or later where that moment is left out. So a day may have 23 or 25 hours, or 23.5, and one that a country skips has
 // none.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Stretches come by session, so a line has met a session before exactly if it was the last one that it met: no line
 // keeps a list of sessions.
 #include "kesto/report/Report.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the report: what was played in a span of time, as tables for a terminal, for programs, and as a page.
 //
 // This file has the figures; each way to show them draws these and counts nothing itself.

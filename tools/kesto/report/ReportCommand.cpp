@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto report`: what was played or recorded in a span of time, as tables for people, as CSV, as JSON and as a page.
 #include "kesto/Commands.h"
 #include "kesto/ServiceDirectories.h"

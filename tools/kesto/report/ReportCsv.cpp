@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names are those of clients: what would move a terminal's cursor is replaced, what would divide a row is quoted, and
 // what a spreadsheet would take for a formula becomes a text.
 #include "kesto/report/ReportCsv.h"

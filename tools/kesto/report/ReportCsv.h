@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A table of the report for spreadsheets and scripts, as RFC 4180 has it, but with the line ends of Unix.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names stand as the clients sent them: JSON can express each character.
 #include "kesto/report/ReportJson.h"
 

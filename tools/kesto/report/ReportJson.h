@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All figures of the report as one JSON object, for programs.
 #pragma once
 

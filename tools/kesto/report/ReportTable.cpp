@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the forms of a report have in common.
 #include "kesto/report/ReportTable.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The tables of a report: by what they are, and what their rows are called.
 #pragma once
 

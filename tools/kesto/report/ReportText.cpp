@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every table has its key at the left, its figures in columns, and its bar in the room that is left.
 #include "kesto/report/ReportText.h"
 

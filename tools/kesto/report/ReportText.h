@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The report for a person at a terminal: tables with bars, and below them what the numbers leave out.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // English, in every locale.
 #include "kesto/report/ReportWords.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Words that the tables and the page of a report share.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto bugs`: the bugs that the service captured, as a table, or one with all its details.
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service may change the folder meanwhile: captures that vanish are left out.
 #include "kesto/results/CapturedBugs.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads the bugs that the service captured from its folder.
 #pragma once
 

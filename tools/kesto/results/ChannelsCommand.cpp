@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto channels`: the drivers' present channels, and on request their changes, as the service sees them.
 #include "foundation/text/LocalTime.h"
 #include "foundation/values/Json.h"

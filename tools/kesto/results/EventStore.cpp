@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Changes of the database's files are noticed by inotify.
 #include "kesto/results/EventStore.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of results: the commands that show what the service wrote or what drivers publish. They change nothing of
 // it.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto events`: the stored events, as a table for people or as JSON lines for programs, and on request future events.
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The forms are tried one after the other; the first that matches the whole text counts.
 #include "kesto/results/MomentText.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto summary`: the file that a session leaves on internal builds, as a timeline that a person can read.
 #include "kesto/Commands.h"
 #include "kesto/Terminal.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Only the last message of each kind is kept, so that sessions of any length can be read.
 #include "kesto/results/Timeline.h"
 

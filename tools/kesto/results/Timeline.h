@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A session's messages for a person who reads them one after the other: the time of each, its differences from the
 // previous message of its kind, the stretches of sound, and the volume events that the service computed.
 #pragma once

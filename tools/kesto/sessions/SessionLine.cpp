@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Stretches, faults and sessions are each gone through once: a store may hold a hundred thousand sessions.
 #include "kesto/sessions/SessionLine.h"
 

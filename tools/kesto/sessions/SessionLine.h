@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of sessions: who played when, for how long and how it ended, a line a session, or one session as a timeline.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names in JSON stand as clients sent them; in tables, what would move a terminal's cursor is replaced.
 #include "kesto/sessions/SessionText.h"
 

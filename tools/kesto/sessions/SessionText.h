@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sessions for a person at a terminal, and for programs.
 #pragma once
 

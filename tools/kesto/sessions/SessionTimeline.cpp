@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time from the first to the last moment is divided into as many parts as there are columns. A column shows what
 // happened in its part.
 #include "kesto/sessions/SessionTimeline.h"

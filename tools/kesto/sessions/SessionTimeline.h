@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One session over its time: when it played, how loud, and where it went wrong.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto sessions`: the sessions of a span of time, a line each, or one of them as a timeline.
 #include "kesto/Commands.h"
 #include "kesto/ServiceDirectories.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto notify`: posts a system notification by writing its file, notifications/<name> in the runtime directory. The
 // text of the file is the state.
 #include "kesto/Commands.h"

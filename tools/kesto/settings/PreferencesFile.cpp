@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading, changing and writing happen under a lock on the directory, because the file itself is replaced each time. A
 // file that the service could not read is not written.
 #include "kesto/settings/PreferencesFile.h"

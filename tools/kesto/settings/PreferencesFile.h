@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of settings: the commands that change preferences and post notifications. It writes to the configuration
 // directory and to the folder of notifications. The service watches both.
 //

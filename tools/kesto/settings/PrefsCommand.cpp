@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto prefs`: shows and changes the preferences of the device, which the service adds to its sessions.
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"

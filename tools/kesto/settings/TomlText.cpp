@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The parser, not a search, finds the statements: each is parsed separately, which gives its key. Only ends of lines
 // that may end a statement are tried.
 #include "kesto/settings/TomlText.h"

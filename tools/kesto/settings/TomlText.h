@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Setting and removing single keys in a TOML text that a person may have written: all other parts, with comments and
 // order, stay the same, byte for byte.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto status`: what the service counted, once or again and again.
 #include "foundation/values/Json.h"
 #include "kesto/Commands.h"

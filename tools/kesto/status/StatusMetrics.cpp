@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The table of counters gives the names: keys become words of the name, and a last key that is a reason or an operation
 // becomes a label.
 #include "kesto/status/StatusMetrics.h"

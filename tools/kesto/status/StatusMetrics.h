@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The status in the text format of Prometheus, as node_exporter's textfile collector reads it.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One request and its answer need no more than a socket: libkesto would start a thread. The socket never blocks, so
 // that who waits for other things, too, is not held up by a service that hangs.
 #include "kesto/status/StatusSource.h"

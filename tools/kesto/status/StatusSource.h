@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the status: what the service counted, for people and for programs that watch it. It asks the service, or
 // reads the file of its ledger while it does not run.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Tables with two columns of numbers: since the service started, and since the counting began. Losses and limits are
 // listed only if there are some, each with its remedy from the table of counters.
 #include "kesto/status/StatusText.h"

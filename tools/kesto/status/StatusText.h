@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The status for a person at a terminal.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The database is opened through SQLite's URI, the only way to declare that it does not change; another file in its
 // place is noticed by its inode number.
 #include "kesto/store/EventDatabase.h"

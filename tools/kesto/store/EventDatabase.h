@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the store: the service's event store as a database for reading, strictly read-only, beside the service
 // while it writes.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A line of the kernel's list: "1: FLOCK  ADVISORY  WRITE 7864 fe:00:408224 0 EOF", the device's numbers in
 // hexadecimal, the inode's in decimal.
 #include "kesto/store/StoreHolder.h"

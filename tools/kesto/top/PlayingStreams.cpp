@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A change of device or volume ends a stretch and begins the next one in the same transaction. So what plays began with
 // the first of those that ended by a change, one after the other.
 #include "kesto/top/PlayingStreams.h"

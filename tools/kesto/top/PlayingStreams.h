@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What plays and records now, by the event store.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The screen is the terminal's alternate one. It gets whole lines, and lines are not wrapped: the caller has cut them.
 #include "kesto/top/Screen.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A terminal as a screen: it is drawn again and again, keys come one by one, and afterwards it is as it was.
 //
 // Signals that end or stop the program come as events, so that every way out leads through the destructor. While the

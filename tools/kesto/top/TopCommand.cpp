@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto top`: what plays now and what the service does, again and again.
 //
 // The screen asks only while somebody can see it: not in a pause or under the list of keys, and not while the program

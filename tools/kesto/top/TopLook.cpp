@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A rate needs two looks at the same counters; the service's last minute stands in for the first of them.
 #include "kesto/top/TopLook.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of top: what plays now and what the service does, on a screen that renews itself.
 //
 // A look is all that is known at one moment: the service's status, and what plays by the store. Who draws or prints a

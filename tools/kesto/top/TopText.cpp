@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each line is cut before it gets colours, so that no escape sequence is cut.
 #include "kesto/top/TopText.h"
 

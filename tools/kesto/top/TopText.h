@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A look for a person at a terminal.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto trace`: shows the results of a trace, or runs a program while a trace measures it.
 #include "kesto/Commands.h"
 #include "kesto/files/InputFile.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service's own code reads the file, so that the warnings match the service's behaviour.
 #include "kesto/trace/TraceParametersFile.h"
 

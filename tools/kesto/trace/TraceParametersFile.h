@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A parameters file of a trace, for the tool: it finds the points that will not be measured before the program runs,
 // and makes a copy for a service that cannot read the file.
 #pragma once

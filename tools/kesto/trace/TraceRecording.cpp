@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The program runs only after a check that it can be measured: the service first traces for a moment, and its results
 // show whether it can read the parameters, where its results are, and whether the tool can read them.
 #include "kesto/trace/TraceRecording.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of traces: recording a program and showing the results. It starts the program, and uses the service through
 // libkesto.
 //

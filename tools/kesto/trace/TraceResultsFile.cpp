@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file may hold millions of records, so the parser's events fill the series directly, without values in between.
 #include "kesto/trace/TraceResultsFile.h"
 

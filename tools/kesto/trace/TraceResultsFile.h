@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The results file of a trace, as the service writes it, grouped by measurement.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files are distinguished by their identity and not by their times, because clocks are too coarse for short traces.
 #include "kesto/trace/TraceResultsPlace.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The place of the service's results, which reports new results since the last check.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Computes percentiles by rank in the sorted values, and boundaries with round numbers.
 #include "kesto/trace/TraceStatistics.h"
 

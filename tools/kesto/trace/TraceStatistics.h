@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Describes a list of measured values by a few numbers and a histogram.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Times have a suitable unit and four digits: enough to compare, few enough to read.
 #include "kesto/trace/TraceView.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The results of a trace on standard output: a table with a histogram of each name for people, or JSON for programs.
 #pragma once
 

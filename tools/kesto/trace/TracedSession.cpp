@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The library calls back on its own thread; each step waits for this callback.
 #include "kesto/trace/TracedSession.h"
 

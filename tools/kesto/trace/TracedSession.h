@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A session of the service that traces from `start` to `stop`, any number of times; it ends with its connection at the
 // latest.
 //

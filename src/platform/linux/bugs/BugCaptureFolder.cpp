@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All steps use names in the open folder, and captures are made and removed under hidden names: even if the service is
 // killed, a capture is complete or does not exist.
 #include "platform/linux/bugs/BugCaptureFolder.h"

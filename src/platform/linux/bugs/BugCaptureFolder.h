@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The folder of captured bugs on the disk: a folder for each capture, numbered from 1; no number is used again.
 //
 //     bug-captures/

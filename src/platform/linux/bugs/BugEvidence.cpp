@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files of /proc report a wrong size, may vanish while they are read, and hold names that foreign processes chose.
 #include "platform/linux/bugs/BugEvidence.h"
 

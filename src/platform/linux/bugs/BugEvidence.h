@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel's information, at the moment of a bug, about the process that showed it and about the sound system.
 //
 // Processes choose their names, may end meanwhile, and their IDs are used again. So each process's folder is opened

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The requesting thread collects the state at the moment of the bug; the background queue reads /proc and writes to the
 // disk, which may block.
 #include "platform/linux/bugs/LinuxBugCapture.h"

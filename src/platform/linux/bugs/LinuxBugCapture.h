@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of bugs: snapshots of the evidence of a bug. It reads /proc and writes below the directory of captures.
 //
 // The bug-capture service: a folder for each snapshot, below the state directory, for later inspection.

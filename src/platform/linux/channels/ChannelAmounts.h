@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the users' folders have taken of the limits of one reading, and whose turn it is.
 //
 // The next to be read is the user who has taken the least: of the limits of which a user has taken a part, the greatest

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A reading has its problems in order, so that a look-up is cheap among many.
 #include "platform/linux/channels/ChannelComplaints.h"
 

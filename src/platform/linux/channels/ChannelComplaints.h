@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Logs each problem of the channel tree once, even if many readings find it, one after the other: it logs what the
 // reading before did not find. A problem that disappeared in between is logged again.
 #pragma once

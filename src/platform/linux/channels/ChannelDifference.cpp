@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // First decides for a whole channel whether it went on counting, and then subtracts: so no counter of a reset channel
 // is subtracted.
 #include "platform/linux/channels/ChannelDifference.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How channels changed from one sample to a later one.
 //
 // Values, hits, transitions and residencies are subtracted; minimum and maximum are those of the later sample, and a

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The parser cuts fields off the text from the left, but those of a state from the right, because its name may hold
 // blanks. It accepts a file as a whole or not at all.
 #include "platform/linux/channels/ChannelFile.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The content of a channel's file:
 //
 //     simple         histogram ms       state

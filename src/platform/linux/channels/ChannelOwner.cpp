@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All texts are one prefix, the owner and one suffix.
 #include "platform/linux/channels/ChannelOwner.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The owner of a channel's file: which publisher writes it, and whether that process still lives.
 //
 //     <root>/<driver>/.kesto-0123456789abcdef.owner                        locked as long as the publisher lives

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which channels are meant, for the sources of channels that read several groups at once.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The root is opened here; the walk below it is in a file of its own.
 #include "platform/linux/channels/ChannelTree.h"
 

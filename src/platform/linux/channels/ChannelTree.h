@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The channel tree: drivers' statistics that programs publish as folders and files.
 //
 //     <root>/<driver>/<group>/<subgroup>/<channel>

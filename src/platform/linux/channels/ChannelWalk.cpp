@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Folders wait on a stack for each user, in the order of their names; the channels are put in order at the end.
 #include "platform/linux/channels/ChannelWalk.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One walk through the channel tree, in short steps: the user who has taken the least of the limits makes the next one
 // (ChannelAmounts.h). A step opens one folder, or reads some files of one.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads two sources, one after the other, with the same selections.
 #include "platform/linux/channels/LinuxReportingChannels.h"
 

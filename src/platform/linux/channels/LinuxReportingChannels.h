@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of channels: the figures that drivers publish. It reads the channel tree and /proc/asound, and does not
 // write.
 //

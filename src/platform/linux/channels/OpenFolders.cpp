@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every step starts from the open folder before it, so that no link on the way can lead out of the tree.
 #include "platform/linux/channels/OpenFolders.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The open folders on the way from the root of the channel tree to the folder that was opened last: the next one is
 // usually near it, and then opening it takes one call.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The parser finds values by their names and not by columns, which differ between kernels; missing or unknown text
 // gives no channel.
 #include "platform/linux/channels/SoundCards.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel's statistics of every stream of a sound card, below /proc/asound, as channels.
 //
 //     card0/id                      PCH              the channel's driver

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What all connections of one listener share. It exists as long as the listener or one of its connections does.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The checks that every frame passes before the connection looks for a call in it.
 #include "platform/linux/connection/ConnectionInput.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The input of one connection: bytes in order of arrival, which it cuts into frames and decodes.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Written bytes stay at the front of the buffer until moving the rest costs less than sending them did.
 #include "platform/linux/connection/ConnectionOutput.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The output of one connection: bytes in order, and descriptors that go with one of their frames.
 //
 // The connection lets one thread at a time use it, and reports when the socket may accept more.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // There are two cases: usually a frame lies whole in the fed bytes; otherwise it began in an earlier read.
 #include "platform/linux/connection/FrameReader.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Cuts a byte stream into frames: a 4-byte little-endian length, then that many bytes.
 //
 // A frame that arrives whole is returned where it lies, without a copy; the reader keeps only a frame that the end of a

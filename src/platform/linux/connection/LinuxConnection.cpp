@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each connection has one lock, for its output and for its end. What only the connection thread uses needs no lock.
 #include "platform/linux/connection/LinuxConnection.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A connection to one client over a Unix stream socket.
 //
 // The connection thread reads: it takes what has come in, up to a limit, into a buffer that all connections share, cuts

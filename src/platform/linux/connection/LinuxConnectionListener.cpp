@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One loop around epoll. It accepts a few clients at a time, and pauses when descriptors run out, so that neither many
 // new clients nor too many clients harm those that are connected.
 #include "platform/linux/connection/LinuxConnectionListener.h"

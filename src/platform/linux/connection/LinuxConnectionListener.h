@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of connections: the socket of the service, its clients' connections, and the frames that they exchange. It
 // uses sockets and epoll. It hands calls to a queue, and the trace's marker and switch page, or the status, to clients
 // that ask. It does not know what a call or a status means or what the service does with it.

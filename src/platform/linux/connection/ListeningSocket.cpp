@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A killed service leaves its socket file behind. Such a file is removed only if no process listens behind it, because
 // a running service must not lose its socket.
 #include "platform/linux/connection/ListeningSocket.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The socket of the service: either one that the service manager opened and passed, or one bound at a path.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Bytes are counted by atomic numbers, and what is below `free` only at its connection: a client that reads what it
 // gets costs no more than that. Whether a holder is full decides the connection thread alone.
 #include "platform/linux/connection/TransitMemory.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The memory of what is on its way through connections: frames that have come only in part, calls that wait to be
 // carried out, and answers that their clients have not read. Each connection has limits of its own; this adds up what
 // all of them hold, so that many connections cannot do together what one cannot do alone.

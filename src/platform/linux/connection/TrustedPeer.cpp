@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel says how much room the groups take if there is too little.
 #include "platform/linux/connection/TrustedPeer.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which clients may know what others did: whose messages and events the service refused, lost or removed.
 #pragma once
 

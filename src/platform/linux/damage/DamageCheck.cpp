@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // SQLite looks at all pages in one step, which only an interruption ends. One that comes before the step is forgotten,
 // so the progress handler asks once more.
 #include "platform/linux/damage/DamageCheck.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of damage to the store's database: how it is noticed, how the database is set aside, and how its rows are
 // read in spite of it.
 //

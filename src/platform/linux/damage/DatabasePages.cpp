@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The layout of both files is SQLite's: https://sqlite.org/fileformat2.html.
 #include "platform/linux/damage/DatabasePages.h"
 

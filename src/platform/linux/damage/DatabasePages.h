@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The pages of an SQLite database that may be damaged, read without SQLite: from its write-ahead log where the log has
 // a newer one, otherwise from the database itself.
 //

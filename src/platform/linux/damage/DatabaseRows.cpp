@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The layout is SQLite's: https://sqlite.org/fileformat2.html. Every number of the file is foreign: it is compared with
 // what is there before it is used.
 #include "platform/linux/damage/DatabaseRows.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rows of an SQLite database that may be damaged, page by page.
 //
 // SQLite finds a row only through the pages above it, so that a damaged one takes everything below along. But a page

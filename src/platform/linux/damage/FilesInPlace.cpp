@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Device and inode identify a file under any name.
 #include "platform/linux/damage/FilesInPlace.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whether an open database still has its files: the database itself, its write-ahead log and the log's index may be
 // removed or replaced under the service, which then would write where no reader looks.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The database itself is renamed last: as long as it has its old name, the renaming is not finished.
 #include "platform/linux/damage/SetAsideFiles.h"
 

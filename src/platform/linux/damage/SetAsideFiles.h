@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Databases that were set aside: renamed, with their logs, so that a new one can be begun under their name.
 //
 // A damaged one has a mark beside it, "<name>-unsaved", until everything that can be read in it has been copied. The

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The age of a file is the time of its last write. Its name holds the wall-clock time, which the device's owner may set
 // back.
 #include "platform/linux/diagnostics/FolderLimits.h"

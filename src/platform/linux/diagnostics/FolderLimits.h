@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps folders that fill up with files of the service's own within limits: beyond them the oldest files go.
 //
 // The cost of reading a folder grows with its files. So for each new file only a sum is updated, while its writer

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A path is walked one folder at a time, each by its descriptor, so that the service uses the folder that it checked.
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 

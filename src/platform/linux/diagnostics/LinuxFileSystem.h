@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of diagnostics: the folders below the diagnostic-log root, their files, and how many of these are kept.
 //
 // Folders and files of the service's own, and files that clients name, on the real file system.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // An open file of the process; its last owner closes it.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A thin layer over the kernel's *at calls, which ensures that none of them follows a link.
 #include "platform/linux/files/FilesAt.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of files: functions with which all other rooms use files safely. It depends on no path and no content.
 //
 // Files and folders by their names in an open folder: one step at a time, and never through a link. So these functions

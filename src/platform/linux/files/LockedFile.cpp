@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Other users cannot read a file until it is locked. So none of them can lock it first, and all see that it is not
 // finished. The administrator's processes, which can open it, do not treat its maker as dead either.
 #include "platform/linux/files/LockedFile.h"

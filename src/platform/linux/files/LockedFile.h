@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file with which a process shows that it lives: the process holds a lock on it, and the kernel releases the lock
 // when the process ends, for any reason. So process IDs, which are used again and differ between namespaces, are not
 // needed.

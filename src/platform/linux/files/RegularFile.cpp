@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The size that the kernel reports is not asked for: files of /proc report none, and others may grow meanwhile.
 #include "platform/linux/files/RegularFile.h"
 

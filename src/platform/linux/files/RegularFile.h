@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading from an open file that must be a regular one, so that reading never waits.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One byte beyond the limit is asked for: a file that has it is too large.
 #include "platform/linux/files/SmallFile.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading a whole small file at any path: opening never blocks, and only regular files within a limit are read.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Bounds for kept files: beyond a number or a size the oldest are removed.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The system's error numbers, as std::error_code and as text that is the same in every locale.
 #pragma once
 

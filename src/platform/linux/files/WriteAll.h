@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writing to a descriptor that may accept fewer bytes than it gets.
 #pragma once
 

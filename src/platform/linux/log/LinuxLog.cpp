@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A line is made once, escaped and cut, so that the journal, standard error and a bug capture have the same text.
 #include "platform/linux/log/LinuxLog.h"
 

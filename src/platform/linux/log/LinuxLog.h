@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the log: lines to journald or to a descriptor, the enabled levels, and the last lines for a snapshot. It
 // uses journald's socket and one descriptor.
 //

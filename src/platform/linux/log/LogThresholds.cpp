@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The list is read item by item; the error quotes the first wrong item.
 #include "platform/linux/log/LogThresholds.h"
 

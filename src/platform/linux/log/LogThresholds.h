@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which log statements are enabled: one level for all tags, and other levels for single tags.
 //
 // Written as a list such as "info" or "default,kerr=debug,kers=error"; of two items for one tag the later counts.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The thread takes all lines that wait, under one lock, and writes them without it.
 #include "platform/linux/log/LogWriter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The thread that writes the log. Callers leave their lines with it and go on, so that a disk or a journal that does
 // not keep up delays no client.
 //

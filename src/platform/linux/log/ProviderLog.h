@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How the providers themselves write to the log.
 //
 // Providers, and some of their threads, exist before the platform is installed and after it is removed, so they hold a

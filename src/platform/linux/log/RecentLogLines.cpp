@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Times become text only when a bug is captured: lines are frequent, bugs are rare.
 #include "platform/linux/log/RecentLogLines.h"
 

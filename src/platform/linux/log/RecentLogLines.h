@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The last lines of the log, kept in memory: they are half of the evidence of a bug, and the service may lack the right
 // to read the journal.
 #pragma once

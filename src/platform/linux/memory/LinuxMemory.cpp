@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The thread that reaches the limit submits the work, so that there is nothing to lock. The limits are read for each
 // piece that a client sends, so they are plain numbers; while they change, a reader may see old beside new ones.
 #include "platform/linux/memory/LinuxMemory.h"

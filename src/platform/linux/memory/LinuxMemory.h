@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of memory: how much of it what clients send may take, and how freed memory returns to the system. It reads
 // limits.toml and asks the threads' heaps to tidy up. It does not know what the memory is used for.
 //

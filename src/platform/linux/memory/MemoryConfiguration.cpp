@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client is one of its user's, so it never gets a larger part than its user.
 #include "platform/linux/memory/MemoryConfiguration.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The device owner's limits for what clients send, in limits.toml: how much memory it may take in all, and which parts
 // of that one user and one client may have.
 #pragma once

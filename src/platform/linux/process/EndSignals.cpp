@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The handlers are called under the lock: they neither wait nor use this object, and `begin` is then called once.
 #include "platform/linux/process/EndSignals.h"
 

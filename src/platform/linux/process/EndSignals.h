@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The signals that ask the process to end: SIGTERM of a service manager, SIGINT of a terminal.
 //
 // All threads block them, and one thread waits for them. That thread does nothing else, so the process notices a signal

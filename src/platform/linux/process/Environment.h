@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The environment, as all programs here read it.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The uptime is CLOCK_BOOTTIME: unlike the monotonic clock, it goes on while the device sleeps.
 #include "platform/linux/process/LinuxClock.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names from /proc/<pid>/comm. A process's place in the cache is its number modulo the size: the cache needs no order,
 // and clients cannot make it grow.
 #include "platform/linux/process/LinuxProcessTable.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of processes: other processes, this one's threads and clock, and the service manager that started it.
 //
 // The process table as /proc shows it.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Failures are ignored: a lost notification affects only the service manager, which has time-outs of its own.
 #include "platform/linux/process/ServiceManager.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Notifications to the service manager that started the service.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Nice values, since real-time priorities would let a busy service starve the audio that it reports about.
 #include "platform/linux/process/Thread.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Threads with a name, for debuggers, and a priority, for the scheduler.
 #pragma once
 

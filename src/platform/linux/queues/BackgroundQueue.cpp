@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One list for all threads. A thread is added only if more items wait than threads are free; it then stays.
 #include "platform/linux/queues/BackgroundQueue.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The concurrent queue of background priority: a few threads. Each is started when an item waits and no other thread is
 // free.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The schedule is ordered by time. The thread sleeps until its first item is due; only an earlier item wakes the
 // thread.
 #include "platform/linux/queues/DelayedWork.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Work that starts later. The first item starts a thread, which sleeps until the next item is due and then submits it
 // to its queue.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A lane has a share in the time for as long as items of it wait.
 #include "platform/linux/queues/FairOrder.h"
 

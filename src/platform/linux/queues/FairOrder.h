@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The order in which the items of many lanes run, so that no lane, process or user waits for the work of others.
 //
 // A lane is a sequence of items, such as the calls of one client. The time of those that run decides whose are next

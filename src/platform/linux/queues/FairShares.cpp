@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The users are a tree with their processes and shares; each node takes part in the contest of its group in the same
 // way.
 #include "platform/linux/queues/FairShares.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Who comes next when many share the time of one thread, so that no one waits for the work of others.
 //
 // A share is what one connection wants of that time. Next comes the user whose shares have taken the least time so far,

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Only the turns of turn queues have an end handler: items of other queues get no turn in which to gather.
 #include "platform/linux/queues/LinuxWorkQueues.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of queues: which thread runs which items, and in which order. It uses threads, their heaps and clocks, and
 // does not know what the items do.
 //

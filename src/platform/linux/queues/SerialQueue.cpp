@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The queue's thread and helpers alike take a turn, run it, and give it back; a helper may leave the rest of it to the
 // queue's thread. Four flags under one lock coordinate them. The thread that has the turn takes the items a few at a
 // time, so that the lock costs little and the order stays fair while others submit.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A serial work queue: a thread that sleeps while no item waits, and otherwise takes all waiting items under one lock.
 // The items taken together are a turn.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The list of all heaps, and how the service's allocator returns all the memory that it can.
 #include "platform/linux/queues/ThreadHeap.h"
 

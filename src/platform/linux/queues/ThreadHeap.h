@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The heap of a thread that works for clients.
 //
 // Each thread has its own heap, which no other thread can tidy. Memory that one thread allocated may be freed by

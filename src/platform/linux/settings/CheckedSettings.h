@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Settings of a configuration file, one by one, by a table of its keys: a wrong value affects only its own setting, and
 // a line says which value belongs there.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // inotify watches only existing directories. So the watcher awaits a missing directory by its name in the nearest
 // directory above it, and checks all directories again each time that such a name comes or goes.
 #include "platform/linux/settings/ConfigurationWatcher.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of settings: preferences, features, device properties and notifications. It reads the configuration
 // directory, watches it with inotify, and never writes there.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A flag is off if it, its table or the file is missing. A value of another type is converted to a
 // truth value, as a preference would be.
 #include "platform/linux/settings/LinuxDeviceSettings.h"

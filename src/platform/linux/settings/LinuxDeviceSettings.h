@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the device's maker has set, in two files of the configuration directory.
 //
 // feature-flags.toml has one table for each domain, with one truth value for each flag. device.toml has one truth value

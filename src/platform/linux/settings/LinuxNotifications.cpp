@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every change that leaves a file in place is a post, as the watcher reports it. The state is read only when a caller
 // asks for it.
 #include "platform/linux/settings/LinuxNotifications.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // System notifications as files: a file in the notifications directory is a name, and its text the 64-bit state in
 // decimal. Writing or touching the file posts the name. So a shell, or any process with rights on the directory, can
 // post, and a name's state lasts.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // To notice a change the provider must know the earlier values. So a change handler makes it read all existing files;
 // all other files are read on demand.
 #include "platform/linux/settings/LinuxPreferences.h"

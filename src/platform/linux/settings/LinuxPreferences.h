@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Preferences as files: preferences/<domain>.toml in the configuration directory holds the keys of one domain.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The only file that includes toml++: it is large and slow to compile, and its wrong assertions need a workaround.
 #include "platform/linux/settings/TomlFile.h"
 

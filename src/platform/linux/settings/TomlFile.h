@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One TOML file of the configuration, and the last good values that it held.
 //
 // A person who edits a file may break it for a while. Its earlier content then stays in force, or the defaults if it

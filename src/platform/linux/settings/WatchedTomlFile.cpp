@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Watches first and then reads, so that no change is missed in between.
 #include "platform/linux/settings/WatchedTomlFile.h"
 

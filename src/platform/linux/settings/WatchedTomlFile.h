@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A TOML file of the configuration directory; its last good values are available at any time.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The values that each key may have.
 #include "platform/linux/store/AnalyticsConfiguration.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The device owner's settings for analytics events, in analytics.toml: which events the service keeps, for how long and
 // how many, and how much a power failure may cost.
 #pragma once

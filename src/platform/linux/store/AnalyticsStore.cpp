@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Batches of events between the threads that send them and the thread that writes them.
 #include "platform/linux/store/AnalyticsStore.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of the store: from a sent event to a row on the disk. No other part uses SQLite or the database in the state
 // directory.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The part behind the store that keeps events: it opens its place, keeps batches of events, tidies up, and closes its
 // place when it is destroyed. The store decides when each happens; the keeper alone decides how and where it keeps
 // events.

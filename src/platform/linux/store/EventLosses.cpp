@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The end of the service reports the losses that are not reported yet, so that none is forgotten.
 #include "platform/linux/store/EventLosses.h"
 

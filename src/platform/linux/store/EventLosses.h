@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Logs the events that could not be kept, by reason: at the first loss of a kind, and then once a
 // minute while losses go on, so that a full disk does not also fill the log.
 #pragma once

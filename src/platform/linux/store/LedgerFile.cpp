@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A file that this version cannot go on with is replaced as a whole, so that a kill leaves the old one or the new one.
 #include "platform/linux/store/LedgerFile.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The file in which the ledger outlives the process: `analytics.ledger` in the state directory, beside the store.
 //
 // The service counts in the mapped file itself. So the kernel has every count as soon as it is made, also when the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The destructor says the rest, so that the lines add up to what the ledger counts.
 #include "platform/linux/store/RemovalReport.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Says in the log that events were removed, and why: one line at the first removal, and then at most one an hour.
 #pragma once
 

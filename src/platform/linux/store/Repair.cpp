@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The small tables of all damaged databases are copied at once, since their numbers go on from one to the next.
 #include "platform/linux/store/Repair.h"
 

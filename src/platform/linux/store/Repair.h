@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What is done about a damaged database: it is set aside, a new one takes the events that come, and what can be read in
 // the damaged one is copied into the new one between them. A service that ends meanwhile begins to copy again at its
 // next start.

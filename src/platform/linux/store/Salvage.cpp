@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each batch prepares its statements again: it costs little, and none is left when the database is closed.
 #include "platform/linux/store/Salvage.h"
 

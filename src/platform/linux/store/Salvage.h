@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Copies what can be read in a damaged database into the new one, a little at a time, so that new events wait for none
 // of it.
 //

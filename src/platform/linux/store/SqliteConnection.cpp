@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The only file of the service that uses SQLite's interface for databases.
 #include "platform/linux/store/SqliteConnection.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One connection to an SQLite file, and its prepared statements. It reduces SQLite's errors to the few kinds that an
 // owner can act on.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What stands in memory and in the database, such as the next ID, changes with a transaction or is dropped with it.
 #include "platform/linux/store/SqliteEventFile.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The SQLite file of the analytics store: it writes events and keeps the file within its limits.
 //
 // Only this connection writes and checkpoints. A lock on the directory keeps a second service away; all other programs

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What to do when the database fails: try again later, set it aside, or count the loss. The keeper never gives up for
 // good.
 #include "platform/linux/store/SqliteKeeper.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps events in an SQLite database in spite of all failures: it looks for damage, sets a damaged database
 // aside and saves what can be read in it, counts and logs the events that it cannot keep, and removes those that are
 // too old or too many.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The store's failures as the ledger knows them.
 #include "platform/linux/store/StoreError.h"
 

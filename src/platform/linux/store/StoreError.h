@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Why the analytics store failed.
 #pragma once
 

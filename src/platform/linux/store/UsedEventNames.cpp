@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names repeat and patterns rarely change, so each thread remembers its last answers, with the version of the patterns.
 #include "platform/linux/store/UsedEventNames.h"
 

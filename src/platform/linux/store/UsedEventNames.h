@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Decides which analytics events the service keeps: the patterns, and the last answers of each thread.
 #pragma once
 

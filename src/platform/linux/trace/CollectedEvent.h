@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // An event on its way from the kernel's pages to the sessions. Ordering copies events a few times, so this type holds
 // only the fields of this system. The larger KernelTraceEvent, with fields of other systems, is made for each session
 // when it gets the event.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The interface between service and clients for events in the kernel's trace, besides the wire protocol: the bytes of
 // one event, and the page that shows whether a trace runs. Plain memory in the machine's own byte order.
 #pragma once

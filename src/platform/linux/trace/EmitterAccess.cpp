@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The page is a sealed memory file: the service maps it for writing first, and the seal then forbids all later writable
 // mappings. Answers are given without the lock.
 #include "platform/linux/trace/EmitterAccess.h"

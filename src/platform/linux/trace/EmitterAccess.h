@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Lets clients emit events: the service gives them the marker of its trace, open for writing, and the page that shows
 // whether a trace runs.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The writer collects records in memory and writes them in large pieces.
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Performance data as a JSON document, for people, for `grep` and for programs alike:
 //
 //     {"project":"KestoReporting","version":4,"records":[

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every length is checked against the rest of the page. The first wrong one ends the page, because the following
 // records cannot be found.
 #include "platform/linux/trace/RingBufferPage.h"

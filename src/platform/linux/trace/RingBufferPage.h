@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads a page of the kernel's trace. The kernel returns the events of one processor in pages, in its own binary form:
 // a time, the number of bytes that follow, and records, each with the time since the record before.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // For each step of the trace every session gets its events as one item of its queue; the number of events on their way
 // is bounded, because that queue may be slow.
 #include "platform/linux/trace/TraceFanOut.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Distributes the events of the one trace: every session gets the events of its codes and its time on its own queue,
 // and then its completion.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Each processor's stream is in order, so merging neighbouring streams orders all of them; this costs almost nothing if
 // one processor does all the work.
 #include "platform/linux/trace/TraceMerger.h"

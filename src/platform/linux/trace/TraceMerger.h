@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Puts the events of all processors into one order, that of time.
 //
 // Each processor's pages come in the order of time, but a page may come before an older page of another processor. So

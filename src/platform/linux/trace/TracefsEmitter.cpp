@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One write. If it fails, the event is lost.
 #include "platform/linux/trace/TracefsEmitter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Writes the service's own events into the kernel's trace.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // tracefs describes its formats as text, which differs between kernels: the service compares the parts that it relies
 // on before the first event, so that it does not read events in a wrong format.
 #include "platform/linux/trace/TracefsInstance.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // One ring buffer of the kernel's tracing, which belongs to the service: made, set up, switched and read through the
 // files of tracefs. It does not touch other traces on the machine.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sessions come and go on any thread, and the reading thread reads the buffers: one lock protects the shared state, and
 // events go to the sessions' own queues.
 #include "platform/linux/trace/TracefsKernelTrace.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of traces: emitting events into the kernel's trace, reading them, and writing the files of results. Only
 // this room uses tracefs.
 //

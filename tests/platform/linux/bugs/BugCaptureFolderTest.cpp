@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The captures on a real disk: complete or missing, within the limits, and never through a link.
 #include "platform/linux/bugs/BugCaptureFolder.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The evidence of processes and of the sound system, from trees like the kernel's and from malformed ones.
 #include "platform/linux/bugs/BugEvidence.h"
 

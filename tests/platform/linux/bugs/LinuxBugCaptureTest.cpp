@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The service as its callers see it: the replies, their times, and the files on the disk.
 #include "platform/linux/bugs/LinuxBugCapture.h"
 

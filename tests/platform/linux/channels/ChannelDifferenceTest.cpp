@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Differences of channels: which values are subtracted, and when a channel was reset.
 #include "platform/linux/channels/ChannelDifference.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The text of a channel's file: its meaning, and its errors.
 #include "platform/linux/channels/ChannelFile.h"
 

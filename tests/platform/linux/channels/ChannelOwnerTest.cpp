@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The owner of a channel, and files of other users in its place.
 #include "platform/linux/channels/ChannelOwner.h"
 #include "platform/linux/channels/ChannelTree.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A correct channel tree, and hostile ones.
 #include "platform/linux/channels/ChannelTree.h"
 #include "platform/linux/channels/ChannelFile.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The reporting channels of this system, published ones and the kernel's, found, sampled and compared as by the
 // service.
 #include "platform/linux/channels/LinuxReportingChannels.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel's statistics of sound cards, from trees that were recorded on cards of several kinds.
 #include "platform/linux/channels/SoundCards.h"
 #include "support/TemporaryDirectory.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A listener on a private socket, with a delegate that records its calls.
 #pragma once
 

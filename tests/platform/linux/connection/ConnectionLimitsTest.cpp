@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Clients that ask for too much or read too little, and too many clients: each limit holds, affects only the client
 // that reached it, and ends with its cause.
 #include "platform/linux/connection/ConnectionHarness.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What many connections hold together, on real sockets: the greedy wait or end, the modest are served, and no frame is
 // lost.
 #include "platform/linux/connection/ConnectionHarness.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Descriptors that go with a frame: on a socket that is full, and in a system that has none to spare.
 #include "platform/linux/connection/ConnectionOutput.h"
 

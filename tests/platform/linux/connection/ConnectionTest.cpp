@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Connections over real sockets: calls and answers, all the ways in which they end, and the time at which the answers
 // of a turn leave.
 #include "platform/linux/connection/ConnectionHarness.h"

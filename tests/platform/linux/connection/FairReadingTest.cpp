@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client that sends little is read beside those that send much, and what cuts a read short loses nothing.
 #include "platform/linux/connection/ConnectionHarness.h"
 #include "platform/linux/connection/ConnectionOutput.h"

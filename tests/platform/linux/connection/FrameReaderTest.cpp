@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Frames come out as they were sent, for any cuts of the stream, and a frame that is only announced takes no memory.
 #include "platform/linux/connection/FrameReader.h"
 

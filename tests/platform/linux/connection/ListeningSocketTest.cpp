@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sockets that are bound at the path of an earlier socket, and sockets that are passed.
 #include "platform/linux/connection/ListeningSocket.h"
 

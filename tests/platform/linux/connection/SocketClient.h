@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A client of a listener that sends any bytes: it can do everything that a hostile client can.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The request for the status: answered at once, by the connection thread alone, and bounded like other requests.
 #include "platform/linux/connection/ConnectionHarness.h"
 #include "support/PrintValues.h"

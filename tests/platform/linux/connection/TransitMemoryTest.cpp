@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What connections hold together: when they are read, who has to wait, and what lets them go on.
 #include "platform/linux/connection/TransitMemory.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Who may know what others did.
 #include "platform/linux/connection/TrustedPeer.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // When the database is checked, and what a check finds.
 #include "platform/linux/damage/DamageCheck.h"
 

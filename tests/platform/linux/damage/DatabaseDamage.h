@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Makes databases with SQL, and damages files as a bad disk or a careless hand does.
 #pragma once
 

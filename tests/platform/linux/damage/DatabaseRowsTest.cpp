@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What can be read of databases that SQLite made, whole and damaged.
 #include "platform/linux/damage/DatabaseRows.h"
 

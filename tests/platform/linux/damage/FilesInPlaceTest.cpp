@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files of a database that are removed or replaced.
 #include "platform/linux/damage/FilesInPlace.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names of databases that were set aside, and what a kill in the middle leaves.
 #include "platform/linux/damage/SetAsideFiles.h"
 

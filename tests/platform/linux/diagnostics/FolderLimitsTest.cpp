@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A folder that fills up: which files are removed, which stay, and how rarely it is read.
 #include "platform/linux/diagnostics/FolderLimits.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"

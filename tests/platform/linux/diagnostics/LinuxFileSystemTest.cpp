@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Folders and files on the real file system: permissions, links of other users, and full disks.
 #include "platform/linux/diagnostics/LinuxFileSystem.h"
 #include "support/TemporaryDirectory.h"

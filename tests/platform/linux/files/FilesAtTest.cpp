@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files by their names in an open folder: links, pipes and folders in their places.
 #include "platform/linux/files/FilesAt.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Lines as they reach a descriptor and a journal, byte for byte, with clients that try to forge lines and a journal
 // that is slow or missing.
 #include "platform/linux/log/LinuxLog.h"

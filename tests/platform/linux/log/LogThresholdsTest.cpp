@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The list of levels in all its forms, and the errors of wrong lists.
 #include "platform/linux/log/LogThresholds.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The thread behind the log, with a log that these tests hold up as a blocked disk would.
 #include "platform/linux/log/LogWriter.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kept lines of the log.
 #include "platform/linux/log/RecentLogLines.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which limits hold while limits.toml changes, when the threads have to tidy their heaps, and that each does so once.
 #include "platform/linux/memory/LinuxMemory.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How much memory what clients send may take: by the machine's memory, by what an owner writes, and by wrong values.
 #include "platform/linux/memory/MemoryConfiguration.h"
 

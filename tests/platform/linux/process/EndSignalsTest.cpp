@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The signals that end the process, each in a process of its own.
 #include "platform/linux/process/EndSignals.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names of real processes, which the tests choose.
 #include "platform/linux/process/LinuxProcessTable.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Lanes and users share the time equally, however much they submit and whenever they come.
 #include "platform/linux/queues/FairOrder.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Real threads. They wait for each other, and so meet at the important moments; no test waits for a fixed time.
 #include "foundation/Mutex.h"
 #include "platform/Turn.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // System notifications as files: which changes post a name, and the states.
 #include "platform/linux/settings/LinuxNotifications.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Configuration that is edited, replaced, moved and broken while it is in use, in all the ways of editors and people;
 // and the watcher that notices the changes.
 #include "platform/linux/settings/LinuxPreferences.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // TOML as values, and files that are broken for a while.
 #include "platform/linux/settings/TomlFile.h"
 

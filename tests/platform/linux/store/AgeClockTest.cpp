@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The age time of the store: clocks that are wrong, set, or stand still do not make events older than they are.
 #include "platform/linux/store/tables/AgeClock.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which events the service keeps, and how many: the settings that an owner may write, and the effect of wrong ones.
 #include "platform/linux/store/AnalyticsConfiguration.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Acknowledged events are kept: with turns and without, from many threads, beyond the backlog, and if the service is
 // killed. The tests read the database as any program would.
 #include "platform/linux/store/AnalyticsStore.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The log's words for every reason for which events are lost, immediately and, at the latest, at the end.
 #include "platform/linux/store/EventLosses.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Databases of the first edition: new events are kept at once, and the old ones move into the new tables with nothing
 // lost and nothing twice, even if the service is killed at any point in between.
 #include "platform/linux/store/ManualClock.h"

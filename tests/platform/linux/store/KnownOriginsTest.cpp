@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sources and sessions in memory: what is remembered stays bounded, whatever becomes of the database.
 #include "platform/linux/store/tables/KnownOrigins.h"
 

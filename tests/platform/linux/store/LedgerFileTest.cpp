@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The ledger in its file: it goes on after the process, however that ended.
 #include "platform/linux/store/LedgerFile.h"
 

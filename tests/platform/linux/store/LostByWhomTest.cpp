@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Whose events were lost: for each reason for which the keeper loses events, it charges those who sent them.
 #include "platform/linux/store/ManualClock.h"
 #include "platform/linux/store/SqliteKeeper.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Keeps events in memory, for tests: the smallest possible keeper.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The database on disks that are full, read-only or damaged, beside readers and other writers, and within its limits:
 // events may be lost, but are counted, and the service goes on.
 #include "platform/linux/store/SqliteKeeper.h"

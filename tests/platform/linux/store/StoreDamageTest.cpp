@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Databases that are overwritten, truncated, replaced or removed, while the service runs and while it does not: what
 // can be read is saved, what cannot is counted, and nothing that is acknowledged afterwards is lost.
 #include "platform/linux/store/AnalyticsStore.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reads an analytics database as every program may: through its own read-only connection.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Stretches in the database: kept with the events that end them, neither lost nor doubled when a transaction or the
 // service ends early, and removed with the events around them.
 #include "platform/linux/damage/DatabaseDamage.h"

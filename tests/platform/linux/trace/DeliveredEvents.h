@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a session of a kernel trace delivers, and whether it calls its handlers as promised.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The descriptors with which clients emit trace events: when clients get them, which clients do, and their limits.
 #include "platform/linux/trace/EmitterAccess.h"
 #include "platform/linux/connection/ConnectionHarness.h"

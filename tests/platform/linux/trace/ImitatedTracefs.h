@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Pages of the kernel's trace made by hand, and imitations of tracefs.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Performance data: the content of a file, the time at which it gets its name, and the log lines of failures.
 #include "platform/linux/trace/LinuxPerformanceWriter.h"
 #include "platform/linux/diagnostics/LinuxFileSystem.h"

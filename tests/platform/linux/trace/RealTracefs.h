@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel's own tracefs for a test, if this machine allows it: mounted in a namespace of the process, and gone with
 // the process.
 #pragma once

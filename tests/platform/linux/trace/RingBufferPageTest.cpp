@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading pages of the kernel's trace: recorded ones, ones made by hand with everything that a page may hold, and
 // malformed ones.
 #include "platform/linux/trace/RingBufferPage.h"

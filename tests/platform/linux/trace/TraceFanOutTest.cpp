@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which session gets which events of the one trace, and when it is completed.
 #include "platform/linux/trace/TraceFanOut.h"
 #include "support/fakes/FakeLog.h"

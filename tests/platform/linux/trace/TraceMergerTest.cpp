@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The events of several processors in one order.
 #include "platform/linux/trace/TraceMerger.h"
 #include "platform/linux/trace/ImitatedTracefs.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // An instance on an imitation of tracefs: how it is found, set up, taken over and read, and the errors of each step.
 #include "platform/linux/trace/TracefsInstance.h"
 #include "platform/linux/trace/ImitatedTracefs.h"

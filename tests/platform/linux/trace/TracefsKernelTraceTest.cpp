@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The kernel event trace service: on an imitation of tracefs, for failures; and on the kernel itself, with real
 // emitting processes, where this machine allows it.
 #include "platform/linux/trace/TracefsKernelTrace.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Every operation of a real service from a shell.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

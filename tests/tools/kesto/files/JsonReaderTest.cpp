@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // JSON as values: whole, and a list element by element.
 #include "kesto/files/JsonReader.h"
 #include "support/PrintValues.h"

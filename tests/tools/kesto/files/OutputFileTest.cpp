@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Files that a user names: what is at the place decides whether it is replaced or written into.
 #include "kesto/files/OutputFile.h"
 #include "platform/linux/files/FileDescriptor.h"

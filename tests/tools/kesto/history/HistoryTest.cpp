@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What is read of a store: stretches, sessions and faults, those that run, and stores that have none.
 #include "kesto/history/History.h"
 

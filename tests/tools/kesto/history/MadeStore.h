@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A store in the service's own schema, with the rows of a test.
 #pragma once
 

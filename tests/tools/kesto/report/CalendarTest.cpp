@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where days begin and end. The moments come from the tables of the time zones, read by another program.
 #include "kesto/report/Calendar.h"
 

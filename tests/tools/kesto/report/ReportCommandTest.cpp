@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto report` as it is shipped, on a store in the service's schema and beside a real service.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

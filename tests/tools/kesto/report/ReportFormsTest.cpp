@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A report as text, as CSV and as JSON.
 #include "kesto/Terminal.h"
 #include "kesto/files/JsonReader.h"

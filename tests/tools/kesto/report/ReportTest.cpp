@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The figures of a report, from plain rows.
 #include "kesto/report/Report.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The time zone of the process, for as long as the object lives.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto bugs`: the service's captures as a table, as JSON, and one with all details.
 #include "end_to_end/Kestod.h"
 #include "platform/linux/bugs/BugCaptureFolder.h"

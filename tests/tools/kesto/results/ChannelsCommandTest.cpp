@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Listing and watching the drivers' channels.
 #include "kesto/channels.hpp"
 #include "support/ParseJson.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reading the event store: as a table, as JSON, filtered, followed, and with errors.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

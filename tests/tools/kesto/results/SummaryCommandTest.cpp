@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Summary files as timelines.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The timeline of a session's messages.
 #include "kesto/results/Timeline.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto sessions` on the store of a real service.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Lines, tables and timelines of sessions that are made up.
 #include "kesto/sessions/SessionText.h"
 #include "kesto/sessions/SessionTimeline.h"

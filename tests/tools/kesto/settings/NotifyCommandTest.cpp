@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Posting notifications, up to the session that gets them.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto prefs`: the service reads the written values, up to the session that gets them.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Changing single keys of a TOML text that a person wrote.
 #include "kesto/settings/TomlText.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What a real service counted, from a shell: while it runs, after it ended, and when there is nothing to read.
 #include "end_to_end/Disks.h"
 #include "end_to_end/Kestod.h"

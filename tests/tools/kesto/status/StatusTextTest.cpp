@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A report as a person and as node_exporter read it.
 #include "kesto/status/StatusText.h"
 #include "kesto/status/StatusMetrics.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto top` beside a real service: its lines for programs, and its screen on a real terminal, with keys, signals and
 // every way out.
 #include "end_to_end/Kestod.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The screen of `kesto top` and its lines for programs, of looks that are made up.
 #include "kesto/top/TopText.h"
 #include "ledger/Report.h"

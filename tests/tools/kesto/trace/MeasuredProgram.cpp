@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A program to be measured: emits so many pairs of events, prints its arguments, and ends with the given status.
 //
 //     kesto_measured_program COUNT STATUS [WORD...]

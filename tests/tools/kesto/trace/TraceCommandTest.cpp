@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The results of a trace, as a table and for programs.
 #include "end_to_end/Kestod.h"
 #include "tools/kesto/Tool.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The warnings about a parameters file, and the copy for a service.
 #include "kesto/trace/TraceParametersFile.h"
 

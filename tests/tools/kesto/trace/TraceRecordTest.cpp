@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A program that a real service measures with a real kernel trace; and the errors if no trace is available.
 #include "end_to_end/Kestod.h"
 #include "platform/linux/trace/RealTracefs.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Results files as the service's writer makes them, and other texts.
 #include "kesto/trace/TraceResultsFile.h"
 

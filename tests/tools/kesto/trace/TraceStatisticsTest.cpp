@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Percentiles and histograms of a few values by hand, and properties for all values.
 #include "kesto/trace/TraceStatistics.h"
 

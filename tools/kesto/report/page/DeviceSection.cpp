@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which device had which share of the time.
 #include "kesto/report/ReportWords.h"
 #include "kesto/report/page/PageColumns.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Faults by device and day. Their colour is their number for each hour of playing: a busy day is no bad day.
 #include "kesto/report/page/PageColumns.h"
 #include "kesto/report/page/PageSections.h"

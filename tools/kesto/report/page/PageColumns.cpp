@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A week begins on Monday.
 #include "kesto/report/page/PageColumns.h"
 

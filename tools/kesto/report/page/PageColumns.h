@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The days of a report as columns of a picture. Too many days are put together: as weeks, as months, as years, as
 // decades.
 #pragma once

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sections of the page, one function and one file each. Each has a heading, a picture, and its figures as a table.
 #pragma once
 

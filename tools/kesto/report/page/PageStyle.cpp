@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The colours of applications are told apart by people with each kind of colour blindness, and differ from the
 // background by a contrast of 3 at least; text by 4.5.
 #include "kesto/report/page/PageStyle.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How the page looks, on light and on dark screens and on paper.
 //
 // The page allows this style and no other: by its hash, so that nothing that a client told can become a style.

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A table behind a picture opens without a script.
 #include "kesto/report/page/PageSections.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A name is read character by character before anything is escaped: so nothing can hide in bytes that a browser reads
 // in another way.
 #include "kesto/report/page/PageText.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Text of the page: names that strangers chose, made harmless, and figures as people read them.
 #pragma once
 

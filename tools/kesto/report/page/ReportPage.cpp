@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The head allows the page's own style and nothing else; a browser refuses whatever a client might have smuggled in.
 #include "kesto/report/page/ReportPage.h"
 

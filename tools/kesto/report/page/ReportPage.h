@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The report as one page that any browser shows: it runs no script, loads nothing, and asks nobody.
 //
 // What clients told is shown as text and as nothing else, whatever it contains. The page stays below 100,000 bytes: of

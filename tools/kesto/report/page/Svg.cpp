@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Bars and lines are paths, which take half the bytes of other shapes. A tenth of a pixel is fine enough.
 #include "kesto/report/page/Svg.h"
 

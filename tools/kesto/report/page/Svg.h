@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A drawing of the page: SVG, whose colours and fonts come from the page's style by class.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A step is 1, 2 or 5 times a power of ten.
 #include "kesto/report/page/TimeAxis.h"
 

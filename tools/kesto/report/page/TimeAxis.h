@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The axis at the left of bars of time: its unit and its marks follow from the longest bar.
 #pragma once
 

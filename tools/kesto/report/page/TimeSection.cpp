@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How long was played a day: stacked bars, the application with the most time at the bottom.
 #include "kesto/report/page/PageColumns.h"
 #include "kesto/report/page/PageSections.h"

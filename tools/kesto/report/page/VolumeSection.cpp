@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How long it was how loud: by time, not by the number of changes.
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sessions that kept up worst, each with its course: when it played on which device, and where its faults were.
 #include "kesto/report/ReportWords.h"
 #include "kesto/report/page/PageSections.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Where a payload names its application: under one key in every message, and under another in the event with which the
 // service reports that a client has gone.
 #include "platform/linux/store/applications/ApplicationRules.h"

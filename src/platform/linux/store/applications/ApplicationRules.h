@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of applications that the store must not know: the device owner's rules about them, in applications.toml, say
 // that their events are not stored, or under a pseudonym.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The key's file is written whole or not at all. A file of another length holds no key, and is replaced.
 #include "platform/linux/store/applications/Pseudonyms.h"
 

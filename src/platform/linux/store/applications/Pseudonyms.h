@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names under which the store keeps applications that it must not know: a keyed hash. The same application has the same
 // pseudonym, so that its sessions can be counted, and without the key no one can try which name yields it.
 //

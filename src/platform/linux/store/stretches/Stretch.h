@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of stretches: who played what for how long, made of the messages on their way into the store. It knows no
 // database.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All open stretches of a session are in the session's state, because every change of that cuts them.
 #include "platform/linux/store/stretches/Stretches.h"
 

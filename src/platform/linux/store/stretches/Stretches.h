@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The stretches of this run of the service: those that run, and those that are over and wait for the database.
 //
 // It follows every message, also those that the store loses. What was not written because a transaction failed waits

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The wall clock's way beyond the running time is summed up with its sign: a clock that starts in 1970 and is then
 // corrected leaves the time that the service did not run.
 #include "platform/linux/store/tables/AgeClock.h"

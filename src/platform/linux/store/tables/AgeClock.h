@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How old events are, whatever the clock on the wall showed when they came.
 //
 // Wall clocks are wrong: a device without a battery for its clock starts in 1970, a user tries another year. So the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The marks are few: two an hour at most, for as long as events are kept. An earlier mark of the same events stays,
 // because it says more.
 #include "platform/linux/store/tables/EventAges.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // When events were kept, in the age time: a mark now and then says that the events below an ID were kept by then. So an
 // event's age depends on nothing that stands in its row.
 #pragma once

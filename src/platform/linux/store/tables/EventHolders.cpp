@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // All holders are in memory; their rows are written with the transactions that change them. A holder without events
 // goes with the next.
 #include "platform/linux/store/tables/EventHolders.h"

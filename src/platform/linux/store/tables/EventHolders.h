@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // How much of the store each of its users holds: a user of the machine, a process by its name, an application that the
 // process names for a session. When the store is full, the oldest events of the largest holder go, so that one client
 // cannot push out the events of all others.

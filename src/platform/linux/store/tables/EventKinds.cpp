@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A kind is looked up in the database once; then its ID is remembered.
 #include "platform/linux/store/tables/EventKinds.h"
 

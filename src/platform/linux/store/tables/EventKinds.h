@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The names of events, each kept once: a kind is the one or two names of a message.
 #pragma once
 

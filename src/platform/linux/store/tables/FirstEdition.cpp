@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Two neighbours with the same payload, sent at nearly the same time under two names, are the two events of a message.
 #include "platform/linux/store/tables/FirstEdition.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Events of the first edition of the database on their way into the second.
 //
 // The first edition kept a message twice, once for each of its events. Its table stays beside the new ones when the

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Sources and sessions side by side.
 #include "platform/linux/store/tables/KnownOrigins.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The sources and sessions that the service announced in this run, and the rows that they have in the database.
 //
 // A source or a session gets its row with its first event, so that clients that send nothing leave nothing. So each is

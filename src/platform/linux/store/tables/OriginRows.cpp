@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `past` is the ID from which on a source or a session that ended has no events.
 #include "platform/linux/store/tables/OriginRows.h"
 

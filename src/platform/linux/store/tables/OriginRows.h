@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rows of sources and sessions: who sent the events that the database holds.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // New kinds and holders get numbers far above those that are saved: a message that is copied later may refer to one
 // that could not be read. Until the end a row without meaning holds that place.
 #include "platform/linux/store/tables/SalvagedTables.h"

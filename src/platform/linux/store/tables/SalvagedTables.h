@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // What the tables of a new database need besides rows that were saved from a damaged one: numbers that go on, and rows
 // in the place of those that could not be read, so that everything that refers to them still has something.
 //

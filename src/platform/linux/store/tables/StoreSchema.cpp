@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The view `events` shows each message as its one or two events. While events of the first edition are left, it shows
 // them, too.
 //

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The room of tables: what stands in the database beside the messages, each kind in a file, with its rows in memory
 // where that is needed. Everything changes with the transaction that SqliteEventFile runs, or is dropped with it.
 //

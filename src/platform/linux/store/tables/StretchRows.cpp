@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Both tables have the columns of the state in the same order.
 #include "platform/linux/store/tables/StretchRows.h"
 

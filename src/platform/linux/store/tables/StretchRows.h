@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The rows of stretches: those that are over, and, for the next start of a service that is killed, those that run.
 //
 // A stretch that is over gets its ID from the sequence of the events, so it is as old as the events around it and goes

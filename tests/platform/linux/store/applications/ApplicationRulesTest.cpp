@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Which names of applications the store may keep, and under which pseudonyms.
 #include "platform/linux/store/applications/ApplicationRules.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Messages in, stretches out: where a stretch begins, where it is cut and where it ends, and how long it was.
 #include "platform/linux/store/stretches/Stretches.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Chromium as Debian packages it. It gets a network of its own that nothing else is in.
 #include "tools/kesto/report/page/Browser.h"
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A browser without a window, a network or a past, that opens a page from a file.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // A report filled by hand, for tests of what draws one: its figures follow simple rules, and nothing counted them.
 #pragma once
 

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Names that strangers chose cannot be more than text, and figures say no more and no less than there is.
 #include "kesto/report/page/PageText.h"
 #include "kesto/report/ReportWords.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The page in a real browser: it has nothing to complain about, and shows the page on light and dark screens.
 #include "kesto/report/page/ReportPage.h"
 #include "support/TemporaryDirectory.h"

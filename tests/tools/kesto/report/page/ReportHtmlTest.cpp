@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto report --html` from a shell: the file that it writes, and, in a real browser, its figures beside those that
 // SQL finds in the same event store.
 #include "platform/linux/store/SqliteConnection.h"

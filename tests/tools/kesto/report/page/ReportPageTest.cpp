@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The page of a report: what stands in it, what cannot stand in it, and how large it becomes.
 #include "kesto/report/page/ReportPage.h"
 #include "kesto/report/page/PageStyle.h"

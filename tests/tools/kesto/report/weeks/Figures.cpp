@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The truth is asked for one figure at a time: slow, and too simple to be wrong in the way of the report.
 #include "tools/kesto/report/weeks/Figures.h"
 

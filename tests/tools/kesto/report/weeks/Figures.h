@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // The figures of a report as numbers with names, so that a report can be held against an independent truth: "all
 // seconds", "day 2026-10-25 faults", "device speaker sessions". What is nothing has no entry.
 #pragma once

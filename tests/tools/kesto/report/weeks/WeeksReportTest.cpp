@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // Reports of made-up weeks hold against the truth: every figure, in zones where clocks change, over several seeds.
 #include "kesto/history/History.h"
 #include "kesto/report/Report.h"

@@ -1,3 +1,4 @@
+// SPDX-License-Identifier: Apache-2.0
 // `kesto report --csv` of made-up weeks: the tables that other programs read hold against the truth.
 #include "support/TemporaryDirectory.h"
 #include "support/weeks/WeeksFile.h"
