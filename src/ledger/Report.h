@@ -34,9 +34,9 @@ struct ServiceProcess {
     std::string_view version;
     bool isInternalBuild = false;
     double started = 0; // seconds since 1970
-    bool (*isStoring)() = [] { return true; }; // whether it stores any events
+    std::function<bool()> isStoring = [] { return true; }; // whether it stores any events
     std::function<bool()> isStoringStretches = [] { return true; };
-    MemoryState (*memory)() = [] { return MemoryState(); };
+    std::function<MemoryState()> memory = [] { return MemoryState(); };
     std::function<Backlog()> backlog = [] { return Backlog(); };
 };
 

@@ -47,8 +47,9 @@ public:
     void summarise();
     // 4. Lets go of the messages; leave it out where the session still has them. Any thread.
     void letGo() { run_.reset(); }
-    // 5. Stops the trace, waits for its events and writes its results. A thread that may wait.
+    // 5. Tells the trace to stop, without waiting for it. Any thread.
     void beginToStopTrace();
+    // The same, if it was not told yet; waits for its events and writes its results. A thread that may wait.
     void stopTrace();
     [[nodiscard]] bool isTraced() const { return trace_ != nullptr; }
     // 6. Adds what the third step counted, and says how many messages of the run were lost for lack of memory.

@@ -43,7 +43,7 @@ public:
     void createTraceFromTraceParams(const TraceParams* params);
     // Starts every trace. A trace that cannot start is logged, and will be stopped like the others.
     void runTraces();
-    // Tells the first trace to stop, and does not wait: what it collects ends now.
+    // Tells the trace to stop, of several the first, and does not wait: it collects no longer.
     void beginToStop();
     // Stops every trace, waits without a limit until each is complete, and writes all results. Ends the process, with
     // status 1, if the file cannot be opened. Another thread than before may call it.

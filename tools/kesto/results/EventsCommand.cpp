@@ -168,6 +168,7 @@ private:
     void passOver()
     {
         filter_.most = 1;
+        filter_.areOldest = false;
         store_.forEach(filter_, [this](const StoredEvent& event) { filter_.afterID = event.id; });
     }
 

@@ -75,10 +75,12 @@ void appendProcess(const Dictionary& report, std::string& text)
     appendGauge("kesto_connections", "Connections that are open now.", ledger::numberIn(report, "now.connections"),
                 text);
     appendGauge("kesto_sessions", "Sessions that exist now.", ledger::numberIn(report, "now.sessions"), text);
-    appendGauge("kesto_waiting_calls", "Calls that wait for the server queue or run.",
-                ledger::numberIn(report, "now.waitingCalls"), text);
-    appendGauge("kesto_waiting_events", "Events that the store has taken and not written.",
-                ledger::numberIn(report, "now.waitingEvents"), text);
+    if (report.find("now")->dictionary()->contains("waitingCalls")) { // an earlier version does not tell it
+        appendGauge("kesto_waiting_calls", "Calls that wait for the server queue or run.",
+                    ledger::numberIn(report, "now.waitingCalls"), text);
+        appendGauge("kesto_waiting_events", "Events that the store has taken and not written.",
+                    ledger::numberIn(report, "now.waitingEvents"), text);
+    }
     appendGauge("kesto_memory_used_bytes", "Memory that what clients sent takes.",
                 ledger::numberIn(report, "memory.used"), text);
     appendGauge("kesto_memory_limit_bytes", "Memory that what clients send may take.",

@@ -170,14 +170,14 @@ void AnalyticsStore::finish()
     finished.get_future().wait();
 }
 
-// The counts of what is being written are with the store's thread: these events are counted here as if they had just
-// come. Should they be committed all the same, the next start finds them in the store.
 std::size_t AnalyticsStore::waitingEvents()
 {
     const foundation::Lock lock(lock_);
     return waiting_.events.size() + (inWriting_ == nullptr ? 0 : inWriting_->size());
 }
 
+// The counts of what is being written are with the store's thread: these events are counted here as if they had just
+// come. Should they be committed all the same, the next start finds them in the store.
 std::size_t AnalyticsStore::giveUp()
 {
     ledger::Tally tally;

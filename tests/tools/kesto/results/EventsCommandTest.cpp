@@ -451,6 +451,16 @@ TEST_F(EventsBehindACursor, AreReadPieceByPieceFromTheOldestOne)
     EXPECT_EQ(printJson({"--after", "e1:5", "--name", "[ef]"}), line(6, "f"));
 }
 
+TEST_F(EventsBehindACursor, AreOnlyThoseToComeWithoutAnyOfThePresentOnes)
+{
+    makeStoreOf("e1", {"a", "b", "c"});
+    const auto follower = tool.start({"events", "--follow", "--after", "e1:1", "--count", "0"});
+    EXPECT_THAT(follower->waitForOutput("\n"), EndsWith("PAYLOAD\n"));
+    database->add(1000, "d");
+    EXPECT_THAT(follower->waitForOutput("1970"),
+                EndsWith("PAYLOAD\n1970-01-01 00:16:40.000 d" + std::string(57, ' ') + "\n"));
+}
+
 TEST_F(EventsBehindACursor, AreAllOfAnotherDatabaseThatTookThePlaceOfTheFirst)
 {
     makeStoreOf("e2", {"a", "b"});

@@ -45,7 +45,8 @@ protected:
               {"active_devices", "speaker"},
               {"PomoSessionVolume", 0.25},
               {"kestoreporting_timestamp", began}});
-        send(client, 14, 18, {{"PomoSessionVolume", 0.75}, {"kestoreporting_timestamp", began + 5}});
+        send(client, support::volume, support::typeState,
+             {{"PomoSessionVolume", 0.75}, {"kestoreporting_timestamp", began + 5}});
         if (stops)
             send(client, playback, support::typeStop,
                  {{"session_output_running", false}, {"kestoreporting_timestamp", began + 10}});
@@ -111,7 +112,8 @@ TEST_F(SessionsCommand, AfterAKillEndWithTheServicesLastWord)
     kestod.startAndAwait();
     WireClient client(kestod.socketPath());
     play(client, "player", 100, false);
-    send(client, 11, 7, {{"late_cycles", 3}}); // the last word comes later than the last change
+    send(client, support::errorCategory, support::typeIssueDetector,
+         {{"late_cycles", 3}}); // the last word comes later than the last change
     kestod.kill();
     EXPECT_THAT(column(7), ElementsAre("end", "service ended"));
 }

@@ -142,13 +142,14 @@ TEST_F(StatusText, SaysThatPlayingTimesAreNotStored)
     EXPECT_THAT(statusText(ledger::report(*ledger, without, false), std::string::npos), HasSubstr(line));
 }
 
-TEST_F(StatusText, SaysNothingOfMemoryForAServiceOfAnEarlierVersion)
+TEST_F(StatusText, SaysNothingOfWhatAnEarlierVersionDoesNotTell)
 {
     Dictionary::Entries entries;
     for (const auto& [key, value] : running())
         if (key.view() != "memory")
-            entries.push_back({key, value});
+            entries.push_back({key, key.view() == "now" ? Dictionary{{"connections", 0}, {"sessions", 0}} : value});
     EXPECT_THAT(statusText(Dictionary(entries), std::string::npos), Not(HasSubstr("memory")));
+    EXPECT_THAT(metricsText(Dictionary(entries)), Not(HasSubstr("waiting")));
 }
 
 TEST_F(StatusText, IsCutToItsWidth)

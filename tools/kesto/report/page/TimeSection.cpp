@@ -122,11 +122,11 @@ private:
         }
         constexpr double roomForValue = 44;
         if (pitch_ >= roomForValue && column.seconds > 0)
-            svg_.text("val", x + pitch_ / 2, y - 5, Svg::Anchor::Middle, valueOf(column.seconds));
+            svg_.text("val", x + pitch_ / 2, y - 5, Svg::Anchor::Middle, valueText(column.seconds));
         svg_.endGroup();
     }
 
-    [[nodiscard]] std::string valueOf(double seconds) const
+    [[nodiscard]] std::string valueText(double seconds) const
     {
         const double value = axis_.valueOf(seconds);
         return value < 0.05 ? "&lt;0.1" : fmt::format("{:.1f}", value);
