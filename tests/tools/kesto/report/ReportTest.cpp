@@ -312,10 +312,10 @@ TEST(ReportOfHistory, BoundsTheColumnsOfADay)
     }
     const Report report = reportOf(historyOf(stretches, {}, sessions));
     EXPECT_THAT(report.applications, SizeIs(100));
-    EXPECT_EQ(report.days[0].byApplication.size(), 64U);
-    EXPECT_EQ(report.days[0].byApplication[63], 37);
-    EXPECT_EQ(report.days[0].byDevice.size(), 64U);
-    EXPECT_EQ(report.days[0].byDevice[63].seconds, 37);
+    EXPECT_EQ(report.days[0].byApplication.size(), 8U);
+    EXPECT_EQ(report.days[0].byApplication[7], 93);
+    EXPECT_EQ(report.days[0].byDevice.size(), 8U);
+    EXPECT_EQ(report.days[0].byDevice[7].seconds, 93);
 }
 
 TEST(ReportOfHistory, SaysWhatItIsAbout)
