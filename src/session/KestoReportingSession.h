@@ -74,7 +74,7 @@ public:
     static constexpr std::size_t largestConfiguration = std::size_t{1} << 20;
 
     [[nodiscard]] bool started() const { return started_; }
-    // Calls the observer whenever the session starts or is stopped, in place of an earlier one; null: nobody.
+    // The session calls the observer when it starts and when it stops. It has one at most; null takes that away.
     void observeStarted(std::move_only_function<void(bool started)> observer)
     {
         startedObserver_ = std::move(observer);

@@ -175,7 +175,7 @@ public:
             session().ended = time_;
     }
 
-    // A kill of the service ends the stretch. Nobody tells the end of the session.
+    // The kill of the service ends the stretch. The session has no end.
     void liveUntilTheServiceIsKilled(double begins, double plays)
     {
         const std::size_t first = weeks_.stretches.size();
