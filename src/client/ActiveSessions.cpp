@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// A session is left out by the number of its run: one that began later is not part of the walk.
+// A session is left out by the number of its run: one that began later is not part of the walk. Many may have
+// begun meanwhile, so each costs a step.
 #include "client/ActiveSessions.h"
 
 #include "client/KestoReportingClientServerInstance.h"
@@ -31,11 +32,23 @@ std::string ActiveSessions::describe(ListAllowance& allowance) const
 
 std::shared_ptr<KestoReportingSession> ActiveSessions::next()
 {
-    for (; client_ != clients_.size(); ++client_, place_ = 0)
-        while (auto session = clients_[client_]->clientReportingSessionMap().startedBehind(place_))
-            if (session->lastRun() <= lastRun_)
-                return session;
-    return nullptr;
+    auto session = step();
+    while (session && *session == nullptr)
+        session = step();
+    return session.value_or(nullptr);
+}
+
+std::optional<std::shared_ptr<KestoReportingSession>> ActiveSessions::step()
+{
+    if (client_ == clients_.size())
+        return std::nullopt;
+    const auto session = clients_[client_]->clientReportingSessionMap().startedBehind(place_);
+    if (session == nullptr) {
+        ++client_;
+        place_ = 0;
+        return nullptr;
+    }
+    return session->lastRun() <= lastRun_ ? session : nullptr;
 }
 
 } // namespace client

@@ -12,6 +12,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <optional>
 #include <string>
 #include <utility>
 
@@ -38,11 +39,12 @@ public:
     [[nodiscard]] std::size_t count() const { return count_; }
     // Those that are started now, for the log.
     [[nodiscard]] std::string describe(ListAllowance& allowance) const;
-    // The next one that has been started since then, or null at the end.
-    [[nodiscard]] std::shared_ptr<KestoReportingSession> next();
+    // One step: the next of them, or null if the one that came next has been started since then. Nothing at the end.
+    [[nodiscard]] std::optional<std::shared_ptr<KestoReportingSession>> step();
 
 private:
     void begin();
+    [[nodiscard]] std::shared_ptr<KestoReportingSession> next(); // null at the end
 
     Clients clients_;
     LogClient logClient_;

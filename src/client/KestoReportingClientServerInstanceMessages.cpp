@@ -136,15 +136,17 @@ bool KestoReportingClientServerInstance::deliverToNextActiveSession(platform::Tu
                                                                     KestoReportingServiceDelegateProtocol& delegate,
                                                                     Delivery& delivery)
 {
-    const auto session = delivery.room == 0 ? nullptr : delivery.sessions->next();
+    const auto session = delivery.room == 0 ? std::nullopt : delivery.sessions->step();
     if (!session) {
         turn.tally.add(ledger::Counter::Deliveries, delivery.room);
         turn.tally.add(ledger::Counter::Inert, delivery.room);
         return false;
     }
+    if (*session == nullptr)
+        return true;
     --delivery.room;
-    deliverToSession(turn, delivery.message, session);
-    deliverToSinks(turn, delegate, delivery.message, session);
+    deliverToSession(turn, delivery.message, *session);
+    deliverToSinks(turn, delegate, delivery.message, *session);
     return true;
 }
 

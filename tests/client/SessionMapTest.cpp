@@ -4,7 +4,9 @@
 #include "support/ServiceHarness.h"
 
 #include <algorithm>
+#include <functional>
 #include <gtest/gtest.h>
+#include <memory>
 #include <rapidcheck/gtest.h>
 #include <unordered_set>
 #include <utility>
@@ -156,39 +158,88 @@ TEST_F(SessionMapTest, KnowsThoseThatAreStartedInTheOrderOfTheMap)
     EXPECT_EQ(started(), std::vector<std::int64_t>());
 }
 
+// What the map is: a list, searched from its beginning. Its places are those of the entries in the order in which they
+// came.
+struct SessionList {
+    struct Entry {
+        client::SessionMap::Place place;
+        std::int64_t reporterID;
+        Session session;
+    };
+
+    [[nodiscard]] Session find(std::int64_t reporterID) const
+    {
+        const auto found = std::ranges::find(entries, reporterID, &Entry::reporterID);
+        return found == entries.end() ? nullptr : found->session;
+    }
+    void set(std::int64_t reporterID, Session session)
+    {
+        const auto found = std::ranges::find(entries, reporterID, &Entry::reporterID);
+        if (found == entries.end())
+            entries.push_back({++lastPlace, reporterID, std::move(session)});
+        else
+            found->session = std::move(session);
+    }
+    void remove(std::int64_t reporterID)
+    {
+        std::erase_if(entries, [=](const Entry& entry) { return entry.reporterID == reporterID; });
+    }
+    [[nodiscard]] Session behind(client::SessionMap::Place place, bool mustBeStarted) const
+    {
+        const auto found = std::ranges::find_if(entries, [=](const Entry& entry) {
+            return entry.place > place && (!mustBeStarted || entry.session->started());
+        });
+        return found == entries.end() ? nullptr : found->session;
+    }
+
+    std::vector<Entry> entries;
+    client::SessionMap::Place lastPlace = 0;
+};
+
+// Also a walk that paused anywhere goes on there, whatever came and went meanwhile.
 TEST(SessionMap, IsAListSearchedFromItsBeginning)
 {
-    const support::TestPlatform platform;
-    EXPECT_TRUE(rc::check([] {
+    support::TestPlatform platform;
+    utility::createServerQueue();
+    const auto inTurn = [&](const std::function<void(platform::Turn&)>& work) {
+        support::onServerQueue(platform.workQueues, work);
+    };
+    EXPECT_TRUE(rc::check([&] {
         client::SessionMap map;
-        Entries list;
-        const auto find = [&](std::int64_t reporterID) {
-            return std::ranges::find(list, reporterID, &Entries::value_type::first);
-        };
-        const auto operation = rc::gen::pair(rc::gen::weightedElement<char>({{6, 's'}, {3, 'r'}, {1, 'c'}}),
-                                             rc::gen::inRange<std::int64_t>(-3, 6));
+        SessionList list;
+        const auto operation =
+            rc::gen::pair(rc::gen::weightedElement<char>({{6, 's'}, {3, 'r'}, {1, 'c'}, {5, 'b'}, {3, 'e'}}),
+                          rc::gen::inRange<std::int64_t>(-3, 6));
         for (const auto& [what, reporterID] :
              *rc::gen::container<std::vector<std::pair<char, std::int64_t>>>(operation)) {
-            const auto place = find(reporterID);
+            const auto known = list.find(reporterID);
             if (what == 's') {
                 const auto session = makeSession(reporterID);
                 map.set(reporterID, session);
-                if (place == list.end())
-                    list.emplace_back(reporterID, session);
-                else
-                    place->second = session;
+                list.set(reporterID, session);
             } else if (what == 'r') {
                 map.remove(reporterID);
-                if (place != list.end())
-                    list.erase(place);
-            } else {
+                list.remove(reporterID);
+            } else if (what == 'c') {
                 map.clear();
-                list.clear();
+                list.entries.clear();
+            } else if (known != nullptr && what == 'b') {
+                inTurn([&](platform::Turn&) { known->start(); });
+            } else if (known != nullptr) {
+                inTurn([&](platform::Turn& turn) { known->stop(turn); });
             }
-            RC_ASSERT(entries(map) == list);
-            RC_ASSERT(map.size() == list.size());
+            RC_ASSERT(map.size() == list.entries.size());
             for (std::int64_t other = -3; other < 6; ++other)
-                RC_ASSERT(map.find(other) == (find(other) == list.end() ? nullptr : find(other)->second));
+                RC_ASSERT(map.find(other) == list.find(other));
+            for (client::SessionMap::Place paused = 0; paused <= list.lastPlace; ++paused) {
+                auto place = paused;
+                RC_ASSERT(map.sessionBehind(place) == list.behind(paused, false));
+                place = paused;
+                RC_ASSERT(map.startedBehind(place) == list.behind(paused, true));
+            }
+            RC_ASSERT(map.startedCount()
+                      == static_cast<std::size_t>(std::ranges::count_if(
+                          list.entries, [](const auto& entry) { return entry.session->started(); })));
         }
     }));
 }
