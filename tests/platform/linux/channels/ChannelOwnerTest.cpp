@@ -2,6 +2,7 @@
 // The owner of a channel, and files of other users in its place.
 #include "platform/linux/channels/ChannelOwner.h"
 #include "platform/linux/channels/ChannelTree.h"
+#include "platform/linux/channels/Unhurried.h"
 #include "support/TemporaryDirectory.h"
 
 #include <cerrno>
@@ -79,7 +80,7 @@ protected:
     // The names of the existing channels.
     [[nodiscard]] std::vector<std::string> channels() const
     {
-        const auto reading = ChannelTree(root).read({{}}).value();
+        const auto reading = ChannelTree(root, {.time = unhurried}).read({{}}).value();
         EXPECT_THAT(reading.problems, IsEmpty()) << "leftover files are not a problem";
         std::vector<std::string> names;
         for (const ReportingChannel& channel : reading.channels)
@@ -213,7 +214,7 @@ TEST_F(ChannelOwnerTest, NoOwnerFileIsMadeWhereThereCanBeNone)
 TEST_F(ChannelOwnerTest, ALineThatNamesNoOwnerIsNotUnderstood)
 {
     support::writeFile(root / "amp/Tx/-/owned", "owner somebody\nsimple\n1\n");
-    const auto reading = ChannelTree(root).read({{}}).value();
+    const auto reading = ChannelTree(root, {.time = unhurried}).read({{}}).value();
     EXPECT_THAT(reading.channels, IsEmpty());
     EXPECT_THAT(reading.problems,
                 ElementsAre(ChannelProblem{"amp/Tx/-/owned", "it is neither simple nor histogram nor state"}));

@@ -2,6 +2,7 @@
 // A correct channel tree, and hostile ones.
 #include "platform/linux/channels/ChannelTree.h"
 #include "platform/linux/channels/ChannelFile.h"
+#include "platform/linux/channels/Unhurried.h"
 #include "support/TemporaryDirectory.h"
 
 #include <algorithm>
@@ -40,7 +41,7 @@ protected:
     }
     [[nodiscard]] ChannelReading read(const ChannelSelection& selection = {}) const
     {
-        return ChannelTree(root).read({selection}).value();
+        return ChannelTree(root, {.time = unhurried}).read({selection}).value();
     }
     // The problem of a wrong file beside a correct one.
     std::string_view onlyProblem()
@@ -334,7 +335,7 @@ TEST_F(ChannelTreeTest, LooksAtSoManyNamesInAllFoldersAndNoMore)
     publish("amp/Tx/-/b", "simple\n1\n");
     publish("amp/Tx/-/c", "simple\n1\n");
     const auto countWith = [&](std::size_t names) {
-        return ChannelTree(root, {.names = names}).read({{}})->leftOut.beyondNames;
+        return ChannelTree(root, {.names = names, .time = unhurried}).read({{}})->leftOut.beyondNames;
     };
     constexpr std::size_t all = 3 * 2 + 2 + 6; // "." and "..", the folders, the files
     EXPECT_EQ(countWith(all), 0U);
@@ -378,8 +379,9 @@ protected:
     {
         return static_cast<std::size_t>(std::ranges::count(reading.channels, user, &ReportingChannel::user));
     }
-    [[nodiscard]] ChannelReading readWith(const ChannelTree::Limits& limits) const
+    [[nodiscard]] ChannelReading readWith(ChannelTree::Limits limits) const
     {
+        limits.time = unhurried;
         return ChannelTree(root, limits).read({{}}).value();
     }
 };

@@ -2,6 +2,7 @@
 // The reporting channels of this system, published ones and the kernel's, found, sampled and compared as by the
 // service.
 #include "platform/linux/channels/LinuxReportingChannels.h"
+#include "platform/linux/channels/Unhurried.h"
 #include "support/TemporaryDirectory.h"
 #include "support/fakes/FakeLog.h"
 
@@ -56,7 +57,7 @@ protected:
     const fs::path sound = directory.path() / "asound";
     support::FakeLog log;
     ledger::Ledger ledger;
-    LinuxReportingChannels channels{root, sound, ledger, ProviderLog(log)};
+    LinuxReportingChannels channels{root, sound, ledger, ProviderLog(log), {.time = unhurried}};
 };
 
 TEST_F(LinuxReportingChannelsTest, AreMissingOnADeviceWithoutPublishers)
@@ -142,12 +143,12 @@ TEST_F(LinuxReportingChannelsTest, NameTheBoundThatASampleMet)
     EXPECT_THAT(log.take(), IsEmpty()) << "once";
     EXPECT_EQ(ledger.account()[ledger::Counter::ChannelsLeftOut], 2U);
 
-    LinuxReportingChannels few(root, sound, ledger, ProviderLog(log), {.channels = 10});
+    LinuxReportingChannels few(root, sound, ledger, ProviderLog(log), {.channels = 10, .time = unhurried});
     EXPECT_EQ(few.channelCount(*find(few, "Speaker", std::nullopt).channels), 10U);
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(Error, "kerl", "channels left out of a sample: 132, beyond the 10 that it takes")));
 
-    LinuxReportingChannels blind(root, sound, ledger, ProviderLog(log), {.names = 4});
+    LinuxReportingChannels blind(root, sound, ledger, ProviderLog(log), {.names = 4, .time = unhurried});
     EXPECT_EQ(blind.channelCount(*find(blind, "Speaker", std::nullopt).channels), 0U);
     EXPECT_THAT(log.take(),
                 ElementsAre(IsLine(Error, "kerl",
@@ -161,7 +162,7 @@ TEST_F(LinuxReportingChannelsTest, SayOnceWhatSeveralGroupsMeet)
     fs::create_directory_symlink(directory.path(), root / "link");
     for (const char* name : {"a", "b", "c", "d", "e"})
         publish("amp/Speaker/MCA/" + std::string(name), "simple\n1\n");
-    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.names = 11});
+    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.names = 11, .time = unhurried});
     const std::vector<ChannelSelection> groups{{"QuarnZT4", {}},     {"Speaker", {}}, {{}, "MCA"},
                                                {"Haptics", "Stats"}, {"Rx", {}},      {{}, "HwAudio2"}};
     const auto atStart = bounded.readChannels(groups);
@@ -249,7 +250,8 @@ TEST_F(LinuxReportingChannelsTest, OfKnownDriversAreReadHoweverManyFoldersCameMe
     const auto publishOf = [&](const std::string& driver) { publish(driver + "/Tx/-/" + driver, "simple\n1\n"); };
     const std::vector<std::string> known{"a", "b", "c", "d", "e"};
     std::ranges::for_each(known, publishOf);
-    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log), {.drivers = known.size() + 2});
+    LinuxReportingChannels bounded(root, sound, ledger, ProviderLog(log),
+                                   {.drivers = known.size() + 2, .time = unhurried});
     const auto subscribed = bounded.createSubscription(*find(bounded, "Tx", std::nullopt).channels);
     for (int other = 0; other < 50; ++other)
         publishOf("other " + std::to_string(other));
