@@ -182,10 +182,8 @@ private:
         const DatabaseWatch watch(options_.database);
         for (std::size_t looks = 0;;) {
             try {
-                if (store_.refresh()) {
+                if (store_.refresh())
                     filter_.afterID = 0;
-                    epoch_.reset();
-                }
                 print();
             } catch (const EventStoreError&) {
                 if (looks == pauses.size())
@@ -199,8 +197,7 @@ private:
 
     void print()
     {
-        if (!epoch_) // of a store that is just being made
-            epoch_ = store_.epoch();
+        noteEpoch();
         store_.forEach(filter_, [this](const StoredEvent& event) {
             filter_.afterID = event.id;
             if (options_.isJson)
@@ -212,10 +209,19 @@ private:
             throw std::runtime_error("the output could not be written");
     }
 
+    // A repair ends with a new epoch, and with events behind the cursor of a program that reads on.
+    void noteEpoch()
+    {
+        auto epoch = store_.epoch();
+        if (options_.isJson && epoch_ && epoch != epoch_)
+            filter_.afterID = 0;
+        epoch_ = std::move(epoch);
+    }
+
     const EventsOptions& options_;
     EventFilter filter_;
     EventStore store_;
-    std::optional<std::string> epoch_;
+    std::optional<std::string> epoch_; // none of a store that is just being made
     EventTable table_;
 };
 

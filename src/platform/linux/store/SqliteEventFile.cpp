@@ -164,6 +164,18 @@ SqliteEventFile::Expected<> SqliteEventFile::beginRun()
     return done;
 }
 
+SqliteEventFile::Expected<> SqliteEventFile::goOnInNewEpoch()
+{
+    const auto epoch = connection_->prepare("SELECT epoch FROM store");
+    if (!epoch)
+        return std::unexpected(epoch.error());
+    const auto row = epoch->step();
+    if (!row)
+        return std::unexpected(row.error());
+    origins_.epoch = epoch->text(0);
+    return {};
+}
+
 // What runs in this run is in memory: rows of it come only from a database that was damaged.
 SqliteEventFile::Expected<> SqliteEventFile::closeEarlierRun(std::optional<double> end)
 {

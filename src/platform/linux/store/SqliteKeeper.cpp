@@ -366,6 +366,12 @@ void SqliteKeeper::heedCheck()
         handleFailure(StoreError::Corrupt);
 }
 
+SqliteKeeper::Expected<> SqliteKeeper::goOnAfterRepair()
+{
+    const auto done = database_->goOnInNewEpoch();
+    return done ? connect() : done;
+}
+
 // True if more is left to do. Nothing is removed meanwhile: what is too old or too much shows when all events are
 // there.
 bool SqliteKeeper::salvageSome()
@@ -374,7 +380,7 @@ bool SqliteKeeper::salvageSome()
         return false;
     auto done = repair_.goOn(*database_);
     if (done && repair_.isDone())
-        done = connect();
+        done = goOnAfterRepair();
     if (!done)
         handleFailure(done.error());
     return done.has_value();

@@ -420,6 +420,28 @@ TEST_F(StoredStretchesTest, ADamagedDatabaseGivesItsStretchesAndWhatRunsIsCounte
     EXPECT_EQ(number("SELECT max(id) FROM stretches"), number("SELECT next_event - 1 FROM store"));
 }
 
+TEST_F(StoredStretchesTest, WhatRunsWhenARepairEndsGoesOn)
+{
+    beginSession(1);
+    for (int number = 0; number < 2000; ++number)
+        add("Generic.State", {{"text", std::string(300, 'x')}});
+    keepBatch();
+    keeper().prepareForEnd();
+    killService();
+    support::overwrite(file, 0, std::string(pageSize, 'x'));
+    beginSession(2);
+    keep("Playback.Start", {{"active_devices", "speaker"}}, 2);
+    ASSERT_EQ(number("SELECT count(*) FROM earlier_epochs"), 1) << "the repair has begun";
+    clock.advance(10);
+    maintain();
+    ASSERT_EQ(number("SELECT count(*) FROM earlier_epochs"), 2) << "and is done";
+    clock.advance(10);
+    keep("Playback.Stop", {}, 2);
+    EXPECT_THAT(stretches(), ElementsAre("20 s on speaker at ?: stopped"));
+    EXPECT_THAT(texts("SELECT past IS NULL FROM sessions ORDER BY id"), ElementsAre("0", "1"));
+    EXPECT_THAT(texts("SELECT past IS NULL FROM sources ORDER BY id"), ElementsAre("0", "1"));
+}
+
 TEST_F(StoredStretchesTest, DamageThatIsFoundWhileTheServiceRunsDoublesNothing)
 {
     beginSession(1);

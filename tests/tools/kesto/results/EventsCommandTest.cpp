@@ -483,6 +483,17 @@ TEST_F(EventsBehindACursor, AreThoseOfTheNewDatabaseOnceItTakesThePlaceOfTheOneT
     EXPECT_EQ(follower->waitForOutput("\"c\""), line(2, "b") + line(1, "c", "e2"));
 }
 
+TEST_F(EventsBehindACursor, AreAllOfADatabaseThatWasRepairedWhileItIsFollowed)
+{
+    makeStoreOf("e1", {"b", "c"});
+    const auto follower = tool.start({"events", "--json", "--follow", "--after", "e1:1"});
+    EXPECT_EQ(follower->waitForOutput("\"c\""), line(2, "c"));
+    database->execute("UPDATE store SET epoch = 'e2'");
+    database->add(1000, "d");
+    EXPECT_THAT(follower->waitForOutput("\"d\""),
+                EndsWith(line(1, "b", "e2") + line(2, "c", "e2") + line(3, "d", "e2")));
+}
+
 TEST_F(EventsBehindACursor, AreNotToldOfAStoreWithoutCursors)
 {
     const auto first = makeStore({"a"});

@@ -13,8 +13,9 @@ namespace {
 constexpr const char* prepareTables = "DROP TABLE IF EXISTS saved_store;"
                                       "CREATE TABLE saved_store AS SELECT * FROM store LIMIT 0;";
 
-// {0}: the last number of an event; {1}: how many more there may be without a count of the database's own. Stretches
-// that ran are left: a row that was removed long ago may be readable again, and would have become far too long.
+// {0}: the last number of an event; {1}: how many more there may be without a count of the database's own. What is
+// saved keeps the epoch that it was known by. Stretches that ran are left: a row that was removed long ago may be
+// readable again, and would have become far too long.
 constexpr std::string_view goOn =
     "BEGIN IMMEDIATE;"
     "UPDATE store SET"
@@ -25,6 +26,8 @@ constexpr std::string_view goOn =
     " next_session = max(next_session, coalesce((SELECT next_session FROM saved_store),"
     "   1000000 + (SELECT coalesce(max(id), 0) FROM sessions))),"
     " kept = max(kept, coalesce((SELECT kept FROM saved_store), 0));"
+    "INSERT OR IGNORE INTO earlier_epochs SELECT store.next_event, store.next_session, saved_store.epoch"
+    " FROM store, saved_store WHERE saved_store.epoch NOT IN (SELECT epoch FROM earlier_epochs);"
     "UPDATE store SET (age_time, wall_time, away, trial, away_below) ="
     " (SELECT age_time, wall_time, away, trial, away_below FROM saved_store)"
     " WHERE age_time < (SELECT age_time FROM saved_store);"
@@ -38,9 +41,12 @@ constexpr std::string_view goOn =
     " HAVING NOT EXISTS (SELECT * FROM holders WHERE application = 'place of holders' AND process = '');"
     "COMMIT";
 
-// The used kinds are looked up in the index, one after the other.
+// Who read meanwhile may have read past what came back, so the epoch changes. The used kinds are looked up in the
+// index, one after the other.
 constexpr const char* complete =
     "BEGIN IMMEDIATE;"
+    "INSERT OR IGNORE INTO earlier_epochs SELECT next_event, next_session, epoch FROM store;"
+    "UPDATE store SET epoch = lower(hex(randomblob(16)));"
     "WITH RECURSIVE used(kind) AS (SELECT min(kind) FROM messages UNION ALL"
     " SELECT (SELECT min(kind) FROM messages WHERE kind > used.kind) FROM used WHERE used.kind IS NOT NULL)"
     " INSERT OR IGNORE INTO kinds(id, name) SELECT kind, 'unknown' FROM used WHERE kind IS NOT NULL;"

@@ -40,7 +40,7 @@ public:
                                                std::int64_t mayHaveMore);
     // Whether that was begun and not finished.
     [[nodiscard]] static StoreExpected<bool> isBegun(SqliteConnection& connection);
-    // When everything is copied: counts the events. The database must be opened again then.
+    // When everything is copied: counts the events and begins a new epoch. The database must be opened again then.
     [[nodiscard]] static StoreExpected<> finish(SqliteConnection& connection);
 
 private:

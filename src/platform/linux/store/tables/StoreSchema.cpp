@@ -68,6 +68,9 @@ constexpr std::string_view laterTables =
     "CREATE TABLE IF NOT EXISTS open_stretches("
     "id INTEGER PRIMARY KEY, holder INTEGER NOT NULL, session INTEGER, recording INTEGER NOT NULL,"
     " began REAL NOT NULL, arrived REAL NOT NULL, device TEXT, format TEXT, channels INTEGER, volume REAL"
+    ") STRICT;"
+    "CREATE TABLE IF NOT EXISTS earlier_epochs("
+    "below INTEGER PRIMARY KEY, sessions_below INTEGER NOT NULL, epoch TEXT NOT NULL"
     ") STRICT;";
 
 constexpr std::string_view view =

@@ -49,7 +49,7 @@ public:
     [[nodiscard]] static StoreExpected<StoreCountsRow> open(SqliteConnection& connection, double wall);
 
     [[nodiscard]] StoreCounts& counts() noexcept { return counts_; }
-    // Random, and the same for as long as the database exists.
+    // Random, and the same for as long as the database exists and is not repaired.
     [[nodiscard]] const std::string& epoch() const noexcept { return epoch_; }
     // Writes the counts with the running transaction, if they changed.
     [[nodiscard]] StoreExpected<> write();
