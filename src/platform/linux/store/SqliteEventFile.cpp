@@ -141,6 +141,7 @@ SqliteEventFile::Expected<> SqliteEventFile::compareCounts()
 }
 
 // A database that this run has not seen yet has no rows of its sources and sessions. Whatever it holds was kept before.
+// One that was repaired begins a new epoch, with new rows of both: so no event belongs to a session of another epoch.
 SqliteEventFile::Expected<> SqliteEventFile::beginRun()
 {
     StoreCounts& counts = counts_.counts();
@@ -162,18 +163,6 @@ SqliteEventFile::Expected<> SqliteEventFile::beginRun()
     if (done)
         origins_.epoch = counts_.epoch(); // else the next opening closes the earlier run
     return done;
-}
-
-SqliteEventFile::Expected<> SqliteEventFile::goOnInNewEpoch()
-{
-    const auto epoch = connection_->prepare("SELECT epoch FROM store");
-    if (!epoch)
-        return std::unexpected(epoch.error());
-    const auto row = epoch->step();
-    if (!row)
-        return std::unexpected(row.error());
-    origins_.epoch = epoch->text(0);
-    return {};
 }
 
 // What runs in this run is in memory: rows of it come only from a database that was damaged.

@@ -48,8 +48,6 @@ public:
     [[nodiscard]] SqliteConnection& connection() noexcept { return *connection_; }
 
     [[nodiscard]] Expected<> setSynchronization(StoreSynchronization synchronization);
-    // After the end of a repair, which gave the database a new epoch: the rows of this run are still there.
-    [[nodiscard]] Expected<> goOnInNewEpoch();
 
     // Inserts between `begin` and `commit` are kept together or not at all; `rollBack` drops them.
     [[nodiscard]] Expected<> begin();

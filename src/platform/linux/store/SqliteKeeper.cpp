@@ -366,12 +366,6 @@ void SqliteKeeper::heedCheck()
         handleFailure(StoreError::Corrupt);
 }
 
-SqliteKeeper::Expected<> SqliteKeeper::goOnAfterRepair()
-{
-    const auto done = database_->goOnInNewEpoch();
-    return done ? connect() : done;
-}
-
 // True if more is left to do. Nothing is removed meanwhile: what is too old or too much shows when all events are
 // there.
 bool SqliteKeeper::salvageSome()
@@ -380,7 +374,7 @@ bool SqliteKeeper::salvageSome()
         return false;
     auto done = repair_.goOn(*database_);
     if (done && repair_.isDone())
-        done = goOnAfterRepair();
+        done = connect();
     if (!done)
         handleFailure(done.error());
     return done.has_value();

@@ -71,7 +71,6 @@ private:
     [[nodiscard]] bool areFilesInPlace();
     void replaceLog();
     void heedCheck();
-    [[nodiscard]] Expected<> goOnAfterRepair();
     [[nodiscard]] bool salvageSome();
     [[nodiscard]] bool tidySome(bool isQuiet, ledger::Tally& tally);
     [[nodiscard]] Expected<> write(std::span<const EventRow> rows, const OriginAnnouncements& announced);

@@ -438,8 +438,9 @@ TEST_F(StoredStretchesTest, WhatRunsWhenARepairEndsGoesOn)
     clock.advance(10);
     keep("Playback.Stop", {}, 2);
     EXPECT_THAT(stretches(), ElementsAre("20 s on speaker at ?: stopped"));
-    EXPECT_THAT(texts("SELECT past IS NULL FROM sessions ORDER BY id"), ElementsAre("0", "1"));
-    EXPECT_THAT(texts("SELECT past IS NULL FROM sources ORDER BY id"), ElementsAre("0", "1"));
+    EXPECT_THAT(texts("SELECT past IS NULL FROM sessions ORDER BY id"), ElementsAre("0", "0", "1"));
+    EXPECT_THAT(texts("SELECT past IS NULL FROM sources ORDER BY id"), ElementsAre("0", "0", "1"));
+    EXPECT_EQ(number("SELECT session FROM stretches"), 3) << "no row belongs to a session of another epoch";
 }
 
 TEST_F(StoredStretchesTest, DamageThatIsFoundWhileTheServiceRunsDoublesNothing)
