@@ -26,7 +26,7 @@ constexpr std::string_view goOn =
     " next_session = max(next_session, coalesce((SELECT next_session FROM saved_store),"
     "   1000000 + (SELECT coalesce(max(id), 0) FROM sessions))),"
     " kept = max(kept, coalesce((SELECT kept FROM saved_store), 0));"
-    "INSERT OR IGNORE INTO earlier_epochs SELECT store.next_event, store.next_session, saved_store.epoch"
+    "INSERT OR IGNORE INTO earlier_epochs SELECT store.next_event, saved_store.epoch"
     " FROM store, saved_store WHERE saved_store.epoch NOT IN (SELECT epoch FROM earlier_epochs);"
     "UPDATE store SET (age_time, wall_time, away, trial, away_below) ="
     " (SELECT age_time, wall_time, away, trial, away_below FROM saved_store)"
@@ -45,7 +45,7 @@ constexpr std::string_view goOn =
 // index, one after the other.
 constexpr const char* complete =
     "BEGIN IMMEDIATE;"
-    "INSERT OR IGNORE INTO earlier_epochs SELECT next_event, next_session, epoch FROM store;"
+    "INSERT OR IGNORE INTO earlier_epochs SELECT next_event, epoch FROM store;"
     "UPDATE store SET epoch = lower(hex(randomblob(16)));"
     "WITH RECURSIVE used(kind) AS (SELECT min(kind) FROM messages UNION ALL"
     " SELECT (SELECT min(kind) FROM messages WHERE kind > used.kind) FROM used WHERE used.kind IS NOT NULL)"

@@ -70,7 +70,7 @@ constexpr std::string_view laterTables =
     " began REAL NOT NULL, arrived REAL NOT NULL, device TEXT, format TEXT, channels INTEGER, volume REAL"
     ") STRICT;"
     "CREATE TABLE IF NOT EXISTS earlier_epochs("
-    "below INTEGER PRIMARY KEY, sessions_below INTEGER NOT NULL, epoch TEXT NOT NULL"
+    "below INTEGER PRIMARY KEY, epoch TEXT NOT NULL"
     ") STRICT;";
 
 constexpr std::string_view view =
