@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The example configuration files are correct, and hold only the defaults, with which the units agree.
+// The example configuration files are correct, and hold only the defaults, with which the units agree. The manual pages
+// have every key.
 #include "platform/linux/memory/MemoryConfiguration.h"
 #include "platform/linux/settings/TomlFile.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
@@ -11,13 +12,16 @@
 #include <iterator>
 #include <regex>
 #include <string>
+#include <vector>
 
 namespace platform {
 namespace {
 
 using foundation::Dictionary;
 using foundation::Value;
+using testing::ElementsAre;
 using testing::IsEmpty;
+using testing::UnorderedElementsAreArray;
 
 std::string textOf(const std::string& name)
 {
@@ -64,6 +68,44 @@ TEST(ExampleConfiguration, LimitsShowEveryDefaultAndTheMostMemory)
     const Dictionary withMemory = parsed(std::regex_replace(text, std::regex("\n# memory_mb"), "\nmemory_mb"));
     EXPECT_EQ(withMemory.size(), 3U) << "a key that the example does not show";
     EXPECT_EQ(readMemoryLimits(withMemory, 0).limits, defaults.limits);
+}
+
+// --- the manual pages
+
+// The keys that a page describes.
+std::vector<std::string> keysOnPage(const std::string& name)
+{
+    const std::string text = textOf("../man/" + name);
+    const std::regex key("\n\\.It Ic ([A-Za-z_-]+) No = ");
+    std::vector<std::string> keys;
+    for (std::sregex_iterator found(text.begin(), text.end(), key); found != std::sregex_iterator(); ++found)
+        keys.push_back((*found)[1]);
+    return keys;
+}
+
+// The keys that the service knows, as it names them when it meets another one.
+std::vector<std::string> keysIn(const std::vector<std::string>& problems)
+{
+    EXPECT_EQ(problems.size(), 1U);
+    const std::string list = std::regex_replace(problems.at(0), std::regex(".*; the keys are "), "");
+    const std::regex separator(", ");
+    return {std::sregex_token_iterator(list.begin(), list.end(), separator, -1), {}};
+}
+
+TEST(ManualPages, DescribeEveryKey)
+{
+    const Dictionary unknown = {{"no-such-key", true}};
+    EXPECT_THAT(keysOnPage("kesto-analytics.toml.5"),
+                UnorderedElementsAreArray(keysIn(readAnalyticsConfiguration(unknown).problems)));
+    EXPECT_THAT(keysOnPage("kesto-applications.toml.5"),
+                UnorderedElementsAreArray(keysIn(readApplicationsConfiguration(unknown).problems)));
+    EXPECT_THAT(keysOnPage("kesto-limits.toml.5"),
+                UnorderedElementsAreArray(keysIn(readMemoryLimits(unknown, 0).problems)));
+    // Of these files the service reads single keys: the examples are tested to have the same ones.
+    EXPECT_THAT(keysOnPage("kesto-device.toml.5"), ElementsAre("InternalBuild"));
+    EXPECT_THAT(keysOnPage("kesto-feature-flags.toml.5"), ElementsAre("Tracing"));
+    EXPECT_THAT(keysOnPage("kesto-preferences.5"),
+                ElementsAre("device_name", "disable_reporting", "spatial-audio-accessory-feature"));
 }
 
 // --- the units
