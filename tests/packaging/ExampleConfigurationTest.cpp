@@ -1,10 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // The example configuration files are correct, and hold only the defaults, with which the units agree. The manual pages
-// have every key.
+// have every key, table and operation.
+#include "client/ServiceOperations.h"
 #include "platform/linux/memory/MemoryConfiguration.h"
 #include "platform/linux/settings/TomlFile.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
+#include "platform/linux/store/SqliteConnection.h"
 #include "platform/linux/store/applications/ApplicationRules.h"
+#include "platform/linux/store/tables/StoreSchema.h"
 
 #include <fstream>
 #include <gmock/gmock.h>
@@ -20,7 +23,10 @@ namespace {
 using foundation::Dictionary;
 using foundation::Value;
 using testing::ElementsAre;
+using testing::ElementsAreArray;
 using testing::IsEmpty;
+using testing::IsSupersetOf;
+using testing::Not;
 using testing::UnorderedElementsAreArray;
 
 std::string textOf(const std::string& name)
@@ -72,15 +78,17 @@ TEST(ExampleConfiguration, LimitsShowEveryDefaultAndTheMostMemory)
 
 // --- the manual pages
 
+// What the expression finds in its first parentheses.
+std::vector<std::string> findAll(const std::string& text, const std::string& expression)
+{
+    const std::regex wanted(expression);
+    return {std::sregex_token_iterator(text.begin(), text.end(), wanted, 1), {}};
+}
+
 // The keys that a page describes.
 std::vector<std::string> keysOnPage(const std::string& name)
 {
-    const std::string text = textOf("../man/" + name);
-    const std::regex key("\n\\.It Ic ([A-Za-z_-]+) No = ");
-    std::vector<std::string> keys;
-    for (std::sregex_iterator found(text.begin(), text.end(), key); found != std::sregex_iterator(); ++found)
-        keys.push_back((*found)[1]);
-    return keys;
+    return findAll(textOf("../man/" + name), "\n\\.It Ic ([A-Za-z_-]+) No = ");
 }
 
 // The keys that the service knows, as it names them when it meets another one.
@@ -106,6 +114,45 @@ TEST(ManualPages, DescribeEveryKey)
     EXPECT_THAT(keysOnPage("kesto-feature-flags.toml.5"), ElementsAre("Tracing"));
     EXPECT_THAT(keysOnPage("kesto-preferences.5"),
                 ElementsAre("device_name", "disable_reporting", "spatial-audio-accessory-feature"));
+}
+
+std::vector<std::string> namesIn(SqliteConnection& database, const std::string& query)
+{
+    std::vector<std::string> names;
+    if (const auto statement = database.prepare(query))
+        while (statement->step().value_or(false))
+            names.emplace_back(statement->text(0));
+    EXPECT_THAT(names, Not(IsEmpty())) << query;
+    return names;
+}
+
+TEST(ManualPages, NameEveryTableAndTheColumnsThatProgramsRead)
+{
+    const auto database = SqliteConnection::open(":memory:");
+    ASSERT_TRUE(database && StoreSchema::make(**database));
+    const std::string text = textOf("../man/kesto-store.7");
+    EXPECT_THAT(findAll(text, "\\b([a-z_]+)\\b"),
+                IsSupersetOf(namesIn(**database,
+                                     "SELECT name FROM sqlite_schema WHERE name NOT LIKE 'sqlite_%'"
+                                     " AND type IN ('table', 'view')")));
+    for (const std::string table : {"events", "sessions", "sources", "stretches"}) {
+        const std::size_t begin = text.find("\n.It Ic " + table + "\n");
+        ASSERT_NE(begin, std::string::npos) << table;
+        const std::string item = text.substr(begin + 1, text.find("\n.It", begin + 1) - begin);
+        EXPECT_THAT(
+            findAll(item, "\n\\.Ic ([a-z_]+)"),
+            UnorderedElementsAreArray(namesIn(**database, "SELECT name FROM pragma_table_info('" + table + "')")));
+    }
+}
+
+TEST(ManualPages, NumberTheOperationsOfTheProtocol)
+{
+    const std::string text = textOf("../man/kesto-protocol.7");
+    std::vector<std::string> names;
+    for (const client::ServiceOperation& operation : client::serviceOperations)
+        names.emplace_back(operation.name());
+    EXPECT_THAT(findAll(text, "\n\\.It [0-9]+\n([A-Za-z]+):"), ElementsAreArray(names));
+    EXPECT_EQ(findAll(text, "\n\\.It ([0-9]+)\n").back(), std::to_string(names.size()));
 }
 
 // --- the units
