@@ -61,7 +61,7 @@ std::pair<std::string, int> answerTo(const std::string& arguments)
 
 TEST(LaunchTest, OnItsCommandLineItOnlySaysWhoItIs)
 {
-    EXPECT_EQ(answerTo("--version"), (std::pair<std::string, int>("kestod 0.1.0\n", 0)));
+    EXPECT_THAT(answerTo("--version"), testing::Pair(testing::StartsWith("kestod "), 0));
     const auto [help, status] = answerTo("--help");
     EXPECT_EQ(status, 0);
     EXPECT_THAT(help, testing::StartsWith("Usage: kestod [--help | --version]\n"));

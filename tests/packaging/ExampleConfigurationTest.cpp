@@ -1,9 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
-// The example configuration files are correct, and hold only the defaults, with which the units agree.
+// The example configuration files are correct, and hold only the defaults, with which the units agree. The manual pages
+// have every key, table and operation.
+#include "client/ServiceOperations.h"
 #include "platform/linux/memory/MemoryConfiguration.h"
 #include "platform/linux/settings/TomlFile.h"
 #include "platform/linux/store/AnalyticsConfiguration.h"
+#include "platform/linux/store/SqliteConnection.h"
 #include "platform/linux/store/applications/ApplicationRules.h"
+#include "platform/linux/store/tables/StoreSchema.h"
 
 #include <fstream>
 #include <gmock/gmock.h>
@@ -11,13 +15,19 @@
 #include <iterator>
 #include <regex>
 #include <string>
+#include <vector>
 
 namespace platform {
 namespace {
 
 using foundation::Dictionary;
 using foundation::Value;
+using testing::ElementsAre;
+using testing::ElementsAreArray;
 using testing::IsEmpty;
+using testing::IsSupersetOf;
+using testing::Not;
+using testing::UnorderedElementsAreArray;
 
 std::string textOf(const std::string& name)
 {
@@ -64,6 +74,85 @@ TEST(ExampleConfiguration, LimitsShowEveryDefaultAndTheMostMemory)
     const Dictionary withMemory = parsed(std::regex_replace(text, std::regex("\n# memory_mb"), "\nmemory_mb"));
     EXPECT_EQ(withMemory.size(), 3U) << "a key that the example does not show";
     EXPECT_EQ(readMemoryLimits(withMemory, 0).limits, defaults.limits);
+}
+
+// --- the manual pages
+
+// What the expression finds in its first parentheses.
+std::vector<std::string> findAll(const std::string& text, const std::string& expression)
+{
+    const std::regex wanted(expression);
+    return {std::sregex_token_iterator(text.begin(), text.end(), wanted, 1), {}};
+}
+
+// The keys that a page describes.
+std::vector<std::string> keysOnPage(const std::string& name)
+{
+    return findAll(textOf("../man/" + name), "\n\\.It Ic ([A-Za-z_-]+) No = ");
+}
+
+// The keys that the service knows, as it names them when it meets another one.
+std::vector<std::string> keysIn(const std::vector<std::string>& problems)
+{
+    EXPECT_EQ(problems.size(), 1U);
+    const std::string list = std::regex_replace(problems.at(0), std::regex(".*; the keys are "), "");
+    const std::regex separator(", ");
+    return {std::sregex_token_iterator(list.begin(), list.end(), separator, -1), {}};
+}
+
+TEST(ManualPages, DescribeEveryKey)
+{
+    const Dictionary unknown = {{"no-such-key", true}};
+    EXPECT_THAT(keysOnPage("kesto-analytics.toml.5"),
+                UnorderedElementsAreArray(keysIn(readAnalyticsConfiguration(unknown).problems)));
+    EXPECT_THAT(keysOnPage("kesto-applications.toml.5"),
+                UnorderedElementsAreArray(keysIn(readApplicationsConfiguration(unknown).problems)));
+    EXPECT_THAT(keysOnPage("kesto-limits.toml.5"),
+                UnorderedElementsAreArray(keysIn(readMemoryLimits(unknown, 0).problems)));
+    // Of these files the service reads single keys: the examples are tested to have the same ones.
+    EXPECT_THAT(keysOnPage("kesto-device.toml.5"), ElementsAre("InternalBuild"));
+    EXPECT_THAT(keysOnPage("kesto-feature-flags.toml.5"), ElementsAre("Tracing"));
+    EXPECT_THAT(keysOnPage("kesto-preferences.5"),
+                ElementsAre("device_name", "disable_reporting", "spatial-audio-accessory-feature"));
+}
+
+std::vector<std::string> namesIn(SqliteConnection& database, const std::string& query)
+{
+    std::vector<std::string> names;
+    if (const auto statement = database.prepare(query))
+        while (statement->step().value_or(false))
+            names.emplace_back(statement->text(0));
+    EXPECT_THAT(names, Not(IsEmpty())) << query;
+    return names;
+}
+
+TEST(ManualPages, NameEveryTableAndTheColumnsThatProgramsRead)
+{
+    const auto database = SqliteConnection::open(":memory:");
+    ASSERT_TRUE(database && StoreSchema::make(**database));
+    const std::string text = textOf("../man/kesto-store.7");
+    EXPECT_THAT(findAll(text, "\\b([a-z_]+)\\b"),
+                IsSupersetOf(namesIn(**database,
+                                     "SELECT name FROM sqlite_schema WHERE name NOT LIKE 'sqlite_%'"
+                                     " AND type IN ('table', 'view')")));
+    for (const std::string table : {"events", "sessions", "sources", "stretches"}) {
+        const std::size_t begin = text.find("\n.It Ic " + table + "\n");
+        ASSERT_NE(begin, std::string::npos) << table;
+        const std::string item = text.substr(begin + 1, text.find("\n.It", begin + 1) - begin);
+        EXPECT_THAT(
+            findAll(item, "\n\\.Ic ([a-z_]+)"),
+            UnorderedElementsAreArray(namesIn(**database, "SELECT name FROM pragma_table_info('" + table + "')")));
+    }
+}
+
+TEST(ManualPages, NumberTheOperationsOfTheProtocol)
+{
+    const std::string text = textOf("../man/kesto-protocol.7");
+    std::vector<std::string> names;
+    for (const client::ServiceOperation& operation : client::serviceOperations)
+        names.emplace_back(operation.name());
+    EXPECT_THAT(findAll(text, "\n\\.It [0-9]+\n([A-Za-z]+):"), ElementsAreArray(names));
+    EXPECT_EQ(findAll(text, "\n\\.It ([0-9]+)\n").back(), std::to_string(names.size()));
 }
 
 // --- the units

@@ -267,7 +267,7 @@ TEST_F(LaunchConfigurationTest, APassedSocketComesFirstAndNeedsNeitherNameNorRun
               0);
 }
 
-TEST_F(LaunchConfigurationTest, AnythingElseThatIsPassedIsRefused)
+TEST_F(LaunchConfigurationTest, APassedSocketOfAnotherKindIsRefused)
 {
     const auto isRefused = [&](int type, bool listens, const char* name) {
         return statusOfChild([&] {

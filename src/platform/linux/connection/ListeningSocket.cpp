@@ -7,11 +7,9 @@
 
 #include <cerrno>
 #include <cstring>
-#include <fcntl.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <systemd/sd-daemon.h>
 
 namespace platform {
 namespace {
@@ -67,19 +65,6 @@ std::string description(const ListeningSocketFailure& failure)
     case ListeningSocketError::SystemError: return std::string(systemErrorText(failure.systemError));
     }
     return "unknown error";
-}
-
-std::expected<std::optional<ListeningSocket>, ListeningSocketFailure> ListeningSocket::passed()
-{
-    const int count = ::sd_listen_fds(1);
-    if (count == 0)
-        return std::nullopt;
-    if (count != 1 || ::sd_is_socket_unix(SD_LISTEN_FDS_START, SOCK_STREAM, 1, nullptr, 0) <= 0)
-        return fail(ListeningSocketError::NotOneUnixListener);
-    FileDescriptor descriptor(SD_LISTEN_FDS_START);
-    if (::fcntl(descriptor.get(), F_SETFL, O_NONBLOCK) != 0)
-        return failWithSystemError();
-    return ListeningSocket(std::move(descriptor), {});
 }
 
 ListeningSocket::Result ListeningSocket::bind(std::filesystem::path path, unsigned permissions)

@@ -11,7 +11,6 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
-#include <systemd/sd-daemon.h>
 #include <unistd.h>
 
 namespace platform {
@@ -158,14 +157,16 @@ TEST_F(ListeningSocketTest, RefusesAPathThatIsTooLongAndTakesTheLongest)
 }
 
 // Socket activation passes descriptors from 3 on, so child processes test it. They exit with 0 if all is well.
-class SocketActivation : public ListeningSocketTest {
+constexpr int firstPassed = 3;
+
+class PassedSocket : public ListeningSocketTest {
 protected:
     // What a child process does with these descriptors.
     template <typename Body> void inChild(const std::vector<int>& passed, Body body)
     {
         EXPECT_EXIT(
             {
-                int target = SD_LISTEN_FDS_START;
+                int target = firstPassed;
                 for (const int descriptor : passed)
                     ::dup2(descriptor, target++);
                 ::setenv("LISTEN_PID", std::to_string(::getpid()).c_str(), 1);
@@ -190,7 +191,7 @@ protected:
     }
 };
 
-TEST_F(SocketActivation, NothingPassedIsNoFailure)
+TEST_F(PassedSocket, NothingPassedIsNoFailure)
 {
     ::unsetenv("LISTEN_FDS");
     const auto socket = ListeningSocket::passed();
@@ -198,20 +199,20 @@ TEST_F(SocketActivation, NothingPassedIsNoFailure)
     EXPECT_FALSE(*socket);
 }
 
-TEST_F(SocketActivation, AListenerThatIsPassedIsTaken)
+TEST_F(PassedSocket, AListenerThatIsPassedIsTaken)
 {
     const FileDescriptor socket = listening();
     inChild({socket.get()}, [this] {
         const auto passed = ListeningSocket::passed();
-        if (!passed || !*passed || (*passed)->descriptor() != SD_LISTEN_FDS_START)
+        if (!passed || !*passed || (*passed)->descriptor() != firstPassed)
             return false;
-        const int flags = ::fcntl(SD_LISTEN_FDS_START, F_GETFL);
-        return (flags & O_NONBLOCK) != 0 && connectError() == 0 && ::accept(SD_LISTEN_FDS_START, nullptr, nullptr) >= 0;
+        const int flags = ::fcntl(firstPassed, F_GETFL);
+        return (flags & O_NONBLOCK) != 0 && connectError() == 0 && ::accept(firstPassed, nullptr, nullptr) >= 0;
     });
     EXPECT_TRUE(std::filesystem::exists(path)) << "the file belongs to the process that bound it";
 }
 
-TEST_F(SocketActivation, IsTakenOnce)
+TEST_F(PassedSocket, IsTakenOnce)
 {
     const FileDescriptor socket = listening();
     inChild({socket.get()}, [] {
@@ -220,7 +221,7 @@ TEST_F(SocketActivation, IsTakenOnce)
     });
 }
 
-TEST_F(SocketActivation, SomethingElseIsRefused)
+TEST_F(PassedSocket, SomethingElseIsRefused)
 {
     const FileDescriptor file(::open("/dev/null", O_RDONLY | O_CLOEXEC));
     inChild({file.get()}, isRefused);
