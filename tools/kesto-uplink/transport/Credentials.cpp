@@ -58,10 +58,13 @@ Credentials readCredentials(const std::filesystem::path& file)
     Credentials credentials;
     try {
         for (const auto& [key, value] : toml::parse(text)) {
-            const auto word = value.value<std::string>();
-            if (!word || word->empty())
-                fail(file, fmt::format("has a {} that is no text", key.str()));
-            if (key == "name")
+            const auto word = value.value_exact<std::string>();
+            const auto isPlain = value.value_exact<bool>();
+            if (key == "plain" ? !isPlain : !word || word->empty())
+                fail(file, fmt::format("has a {} that is not {}", key.str(), key == "plain" ? "true or false" : "text"));
+            if (key == "plain")
+                credentials.isPlain = *isPlain;
+            else if (key == "name")
                 credentials.name = *word;
             else if (key == "password")
                 credentials.password = *word;
@@ -70,7 +73,7 @@ Credentials readCredentials(const std::filesystem::path& file)
             else if (key == "seed")
                 credentials.seed = *word;
             else
-                fail(file, fmt::format("has the unknown key {}: it takes name, and password or key and seed", key.str()));
+                fail(file, fmt::format("has the unknown key {}: it takes name, password or key and seed, and plain", key.str()));
         }
     } catch (const toml::parse_error& error) {
         fail(file, fmt::format("is no TOML in line {}: {}", error.source().begin.line, error.description()));

@@ -10,10 +10,11 @@
 namespace kesto_uplink {
 
 struct Credentials {
-    std::string name; // a token of a subject: letters, digits, - and _
-    std::string password; // empty with a key
-    std::string publicKey; // NKey, U...
-    std::string seed; // of that key, SU...
+    std::string name = {}; // a token of a subject: letters, digits, - and _
+    std::string password = {}; // empty with a key
+    std::string publicKey = {}; // NKey, U...
+    std::string seed = {}; // of that key, SU...
+    bool isPlain = false; // may be used without encryption
 };
 
 // A line for a person.

@@ -21,17 +21,17 @@ constexpr const char* confirmationStream = "KESTO_STORED";
 
 Answer refused(std::string sentence)
 {
-    return {.kind = Answer::Kind::refused, .sentence = std::move(sentence)};
+    return {Answer::Kind::Refused, false, std::move(sentence)};
 }
 
 Answer away(std::string sentence)
 {
-    return {.kind = Answer::Kind::away, .sentence = std::move(sentence)};
+    return {Answer::Kind::Away, false, std::move(sentence)};
 }
 
 Answer interrupted()
 {
-    return {.kind = Answer::Kind::interrupted, .sentence = "the program was told to end"};
+    return {Answer::Kind::Interrupted, false, "the program was told to end"};
 }
 
 std::string lastError(natsStatus status)
@@ -49,7 +49,12 @@ std::string hostOf(std::string_view url)
     return std::string(url.substr(0, url.find(':')));
 }
 
-// What is wrong with the server's entry in the configuration, or nothing.
+std::string_view bytesOf(const natsMsg* message)
+{
+    return {natsMsg_GetData(message), static_cast<std::size_t>(natsMsg_GetDataLength(message))};
+}
+
+// What is wrong with the server's entry in the configuration; empty: nothing.
 std::string wrongEntry(const std::string& url, bool isPlain)
 {
     if (url.contains('@'))
@@ -59,7 +64,7 @@ std::string wrongEntry(const std::string& url, bool isPlain)
     if (!url.starts_with("nats://"))
         return fmt::format("the server {} must begin with tls://, or nats:// without encryption", url);
     if (!isPlain)
-        return fmt::format("the server {} is without encryption: write tls://, or allow it with plain = true", url);
+        return fmt::format("the server {} is without encryption: write tls://, or allow it by plain = true in the credentials file", url);
     return {};
 }
 
@@ -67,14 +72,14 @@ bool isFull(jsErrCode code)
 {
     constexpr std::array codes{JSStreamStoreFailedErr, JSStorageResourcesExceededErr, JSMemoryResourcesExceededErr,
                                JSAccountResourcesExceededErr, JSInsufficientResourcesErr};
-    return std::ranges::contains(codes, code);
+    return std::ranges::find(codes, code) != codes.end();
 }
 
 bool isForGood(jsErrCode code)
 {
     constexpr std::array codes{JSStreamMessageExceedsMaximumErr, JSBadRequestErr, JSNotEnabledForAccountErr,
                                JSNotEnabledErr, JSStreamNotMatchErr};
-    return std::ranges::contains(codes, code);
+    return std::ranges::find(codes, code) != codes.end();
 }
 
 } // namespace
@@ -118,12 +123,11 @@ JetStream::Options JetStream::optionsFor(const std::string& url)
         set(natsOptions_SetUserInfo, credentials_.name.c_str(), credentials_.password.c_str());
     else
         set(natsOptions_SetNKey, credentials_.publicKey.c_str(), &JetStream::sign, static_cast<void*>(this));
-    if (url.starts_with("tls://")) {
-        set(natsOptions_SetSecure, true);
-        set(natsOptions_SetExpectedHostname, hostOf(url).c_str());
-        if (!servers_.authorities.empty())
-            set(natsOptions_LoadCATrustedCertificates, servers_.authorities.c_str());
-    }
+    set(natsOptions_SetSecure, url.starts_with("tls://"));
+    // Also without tls://, since a server may insist on encryption.
+    set(natsOptions_SetExpectedHostname, hostOf(url).c_str());
+    if (!servers_.authorities.empty())
+        set(natsOptions_LoadCATrustedCertificates, servers_.authorities.c_str());
     if (status != NATS_OK)
         options.reset();
     return options;
@@ -131,7 +135,7 @@ JetStream::Options JetStream::optionsFor(const std::string& url)
 
 Answer JetStream::connectTo(const std::string& url)
 {
-    if (const std::string wrong = wrongEntry(url, servers_.isPlain); !wrong.empty())
+    if (const std::string wrong = wrongEntry(url, credentials_.isPlain); !wrong.empty())
         return refused(wrong);
     const Options options = optionsFor(url);
     if (!options)
@@ -163,9 +167,9 @@ Answer JetStream::connectTo(const std::string& url)
     jsOptions_Init(&contextOptions);
     contextOptions.Wait = limits_.answer.count();
     jsCtx* context = nullptr;
-    if (const natsStatus made2 = natsConnection_JetStream(&context, connection.get(), &contextOptions);
-        made2 != NATS_OK)
-        return away(fmt::format("{} has no streams: {}", url, lastError(made2)));
+    if (const natsStatus streams = natsConnection_JetStream(&context, connection.get(), &contextOptions);
+        streams != NATS_OK)
+        return away(fmt::format("{} has no streams: {}", url, lastError(streams)));
     const std::scoped_lock lock(mutex_);
     connection_ = std::move(connection);
     context_.reset(context);
@@ -183,7 +187,7 @@ Answer JetStream::connect()
         Answer answer = connectTo(url);
         if (answer.isStored())
             return answer;
-        if (!worst || answer.kind == Answer::Kind::refused)
+        if (!worst || answer.kind == Answer::Kind::Refused)
             worst = std::move(answer);
     }
     return worst.value_or(refused("the configuration names no servers"));
@@ -219,16 +223,15 @@ Answer JetStream::failure(natsStatus status, jsErrCode code)
     if (natsConnection_GetLastError(connection_.get(), &complaint) == NATS_NOT_PERMITTED)
         return refused(fmt::format("{} refuses {}: {}; check the permissions of this name at the servers", server_,
                                    credentials_.name, complaint));
+    if (status == NATS_NO_RESPONDERS) // the library then gives a code, too
+        return away(fmt::format("no stream at {} takes {}: it is missing, or has no leader for now", server_,
+                                eventSubject_));
     if (isFull(code))
-        return {.kind = Answer::Kind::full,
-                .sentence = fmt::format("the stream is full: {}; the device keeps its events and tries again",
-                                        lastError(status))};
+        return {Answer::Kind::Full, false,
+                fmt::format("the stream is full: {}; the device keeps its events and tries again", lastError(status))};
     if (status == NATS_MAX_PAYLOAD || isForGood(code))
         return refused(fmt::format("{} refuses the batch: {}; check max_payload and the limits of the stream", server_,
                                    lastError(status)));
-    if (status == NATS_NO_RESPONDERS)
-        return away(fmt::format("no stream at {} takes {}: it is missing, or has no leader for now", server_,
-                                eventSubject_));
     if (status == NATS_TIMEOUT)
         return away(fmt::format("{} did not answer in time", server_));
     return away(fmt::format("the connection to {} is lost: {}", server_, lastError(status)));
@@ -256,15 +259,17 @@ Answer JetStream::put(const std::string& id, std::string_view batch)
     const std::unique_ptr<jsPubAck, Destroyer<jsPubAck_Destroy>> stored(received);
     if (status != NATS_OK)
         return failure(status, code);
-    return {.duplicate = stored->Duplicate};
+    return {Answer::Kind::Stored, stored->Duplicate, {}};
 }
 
+// Nobody answers where the stream is missing.
 Answer JetStream::confirmationsFailed(natsStatus status)
 {
-    if (status == NATS_NO_RESPONDERS)
-        return away(fmt::format("{} has no stream {}: nothing tells what the fleet's store has", server_,
-                                confirmationStream));
-    return failure(status, {});
+    Answer answer = failure(status, {});
+    if (answer.kind == Answer::Kind::Away && (status == NATS_TIMEOUT || status == NATS_NO_RESPONDERS))
+        answer.sentence = fmt::format("{} does not tell what the fleet's store has: the stream {} is missing or away",
+                                      server_, confirmationStream);
+    return answer;
 }
 
 Transport::Confirmed JetStream::lastConfirmation(const std::string& device)
@@ -287,13 +292,13 @@ Transport::Confirmed JetStream::lastConfirmation(const std::string& device)
         return std::optional<Confirmation>();
     if (status != NATS_OK)
         return std::unexpected(confirmationsFailed(status));
-    return confirmationIn({natsMsg_GetData(message.get()), static_cast<std::size_t>(natsMsg_GetDataLength(message.get()))});
+    return confirmationIn(bytesOf(message.get()));
 }
 
 Transport::Confirmed JetStream::awaitConfirmation(std::chrono::milliseconds limit)
 {
     if (!connection_ || !confirmations_)
-        return std::unexpected(away("there is no connection"));
+        return std::unexpected(isInterrupted() ? interrupted() : away("there is no connection"));
     natsMsg* received = nullptr;
     const natsStatus status = natsSubscription_NextMsg(&received, confirmations_.get(), limit.count());
     const Message message(received);
@@ -301,7 +306,7 @@ Transport::Confirmed JetStream::awaitConfirmation(std::chrono::milliseconds limi
         return std::optional<Confirmation>();
     if (status != NATS_OK)
         return std::unexpected(confirmationsFailed(status));
-    return confirmationIn({natsMsg_GetData(message.get()), static_cast<std::size_t>(natsMsg_GetDataLength(message.get()))});
+    return confirmationIn(bytesOf(message.get()));
 }
 
 } // namespace kesto_uplink

@@ -21,9 +21,8 @@
 namespace kesto_uplink {
 
 struct Servers {
-    std::vector<std::string> urls; // tls://HOST:PORT; nats://HOST:PORT only if plain
-    bool isPlain = false; // no encryption, as the configuration says in so many words
-    std::filesystem::path authorities; // PEM; empty: those that the system trusts
+    std::vector<std::string> urls = {}; // tls://HOST:PORT, or nats://HOST:PORT without encryption
+    std::filesystem::path authorities = {}; // PEM; empty: those that the system trusts
 };
 
 struct TimeLimits {

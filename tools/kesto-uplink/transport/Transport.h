@@ -16,24 +16,24 @@
 namespace kesto_uplink {
 
 struct Answer {
-    enum class Kind {
-        stored, // the stream has it
-        away, // no server answers within the time limit
-        full, // the stream takes nothing more for now, and has taken nothing of this
-        refused, // not before a person changes something: rights, password, certificate, configuration
-        interrupted, // `interrupt` was called
+    enum class Kind : std::uint8_t {
+        Stored, // the stream has it
+        Away, // no server answers within the time limit
+        Full, // the stream takes nothing more for now, and has taken nothing of this
+        Refused, // not before a person changes something: rights, password, certificate, configuration
+        Interrupted, // `interrupt` was called
     };
 
-    Kind kind = Kind::stored;
+    Kind kind = Kind::Stored;
     bool duplicate = false; // the stream had a message of this ID already
-    std::string sentence; // for people, of every kind but `stored`: what was wrong, and what to do
+    std::string sentence = {}; // for people, of every kind but `Stored`: what was wrong, and what to do
 
-    [[nodiscard]] bool isStored() const noexcept { return kind == Kind::stored; }
+    [[nodiscard]] bool isStored() const noexcept { return kind == Kind::Stored; }
 };
 
 // The fleet's store has all rows of this epoch up to this ID.
 struct Confirmation {
-    std::string epoch;
+    std::string epoch = {};
     std::int64_t id = 0;
 
     bool operator==(const Confirmation&) const = default;
@@ -49,7 +49,7 @@ public:
     Transport(const Transport&) = delete;
     Transport& operator=(const Transport&) = delete;
 
-    // Connects to the first server that answers. Without a connection the other calls answer `away`.
+    // Connects to the first server that answers. Without a connection the other calls answer `Away`.
     virtual Answer connect() = 0;
     virtual void disconnect() = 0;
 

@@ -45,11 +45,11 @@ public:
     {
         connected_ = false;
         if (isInterrupted())
-            return {.kind = Kind::interrupted};
+            return {Kind::Interrupted, false, {}};
         if (!stream_.isReachable)
             return away("no server is there");
         if (hasWrongPassword)
-            return {.kind = Kind::refused, .sentence = "wrong password: check the credentials file"};
+            return {Kind::Refused, false, "wrong password: check the credentials file"};
         ++stream_.connections;
         putsOfConnection_ = 0;
         return connected_ = true, Answer{};
@@ -66,23 +66,23 @@ public:
             interruption_.wait_for(lock, std::chrono::milliseconds(200), [this] { return isInterrupted_; });
         }
         if (isInterrupted())
-            return {.kind = Kind::interrupted};
+            return {Kind::Interrupted, false, {}};
         if (isFrozen)
             return away("no answer in time");
         if (lacksPermission)
-            return {.kind = Kind::refused, .sentence = "permissions: check the accounts"};
+            return {Kind::Refused, false, "permissions: check the accounts"};
         if (stream_.isFull)
-            return {.kind = Kind::full, .sentence = "the stream is full"};
+            return {Kind::Full, false, "the stream is full"};
         if (stream_.losesConnectionsAfter != 0 && ++putsOfConnection_ > stream_.losesConnectionsAfter) {
             connected_ = false;
             return away("the connection is lost");
         }
-        const bool isKnown = std::ranges::contains(stream_.messages, id, &std::pair<std::string, std::string>::first);
+        const bool isKnown = std::ranges::any_of(stream_.messages, [&](const auto& message) { return message.first == id; });
         if (!isKnown)
             stream_.messages.emplace_back(id, batch);
         if (stream_.afterStoring)
             stream_.afterStoring();
-        return {.duplicate = isKnown};
+        return {Kind::Stored, isKnown, {}};
     }
 
     Confirmed lastConfirmation(const std::string& device) override
@@ -99,7 +99,7 @@ public:
         if (!isConnected())
             return std::unexpected(away("there is no connection"));
         if (isInterrupted())
-            return std::unexpected(Answer{.kind = Kind::interrupted});
+            return std::unexpected(Answer{Kind::Interrupted, false, {}});
         const auto next = current();
         if (next == told_)
             return std::optional<kesto_uplink::Confirmation>();
@@ -115,7 +115,7 @@ public:
     }
 
 private:
-    static Answer away(std::string sentence) { return {.kind = Kind::away, .sentence = std::move(sentence)}; }
+    static Answer away(std::string sentence) { return {Kind::Away, false, std::move(sentence)}; }
 
     bool isConnected() const { return connected_ && stream_.isReachable; }
     bool isInterrupted()

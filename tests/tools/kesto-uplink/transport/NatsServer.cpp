@@ -124,6 +124,7 @@ void NatsServer::kill()
 void NatsServer::freeze()
 {
     ::kill(process_, SIGSTOP);
+    ::waitpid(process_, nullptr, WUNTRACED);
 }
 
 void NatsServer::goOn()

@@ -72,9 +72,10 @@ public:
     std::unique_ptr<Transport> device(Credential credential) override
     {
         return std::make_unique<kesto_uplink::JetStream>(
-            kesto_uplink::Servers{.urls = {server_.url()}, .isPlain = true},
+            kesto_uplink::Servers{.urls = {server_.url()}},
             kesto_uplink::Credentials{.name = credential == Credential::anothersSubject ? "forger" : "alpha",
-                                      .password = credential == Credential::wrongPassword ? "guessed" : "secret"},
+                                      .password = credential == Credential::wrongPassword ? "guessed" : "secret",
+                                      .isPlain = true},
             kesto_uplink::TimeLimits{.connect = 2s, .answer = 400ms});
     }
     void kill() override { server_.kill(); }
@@ -113,9 +114,9 @@ TYPED_TEST_SUITE(TransportContract, Fleets, Names);
 TYPED_TEST(TransportContract, aBatchIsStoredWithItsIDAndItsBytes)
 {
     const std::string bytes("\x28\xb5\x00\xff", 4);
-    ASSERT_EQ(this->transport->connect().kind, Answer::Kind::stored);
+    ASSERT_EQ(this->transport->connect().kind, Answer::Kind::Stored);
     const Answer answer = this->transport->put("device:epoch:1:7", bytes);
-    EXPECT_EQ(answer.kind, Answer::Kind::stored);
+    EXPECT_EQ(answer.kind, Answer::Kind::Stored);
     EXPECT_FALSE(answer.duplicate);
     EXPECT_THAT(this->fleet.stored(), ElementsAre(Pair("device:epoch:1:7", bytes)));
 }
@@ -135,18 +136,18 @@ TYPED_TEST(TransportContract, withoutAServerItIsAwayAndSaysSo)
 {
     this->fleet.kill();
     const Answer answer = this->transport->connect();
-    EXPECT_EQ(answer.kind, Answer::Kind::away);
+    EXPECT_EQ(answer.kind, Answer::Kind::Away);
     EXPECT_NE(answer.sentence, "");
 }
 
 TYPED_TEST(TransportContract, withoutAConnectionItIsAway)
 {
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::away);
-    EXPECT_EQ(this->transport->lastConfirmation(device).error().kind, Answer::Kind::away);
-    EXPECT_EQ(this->transport->awaitConfirmation(1ms).error().kind, Answer::Kind::away);
+    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Away);
+    EXPECT_EQ(this->transport->lastConfirmation(device).error().kind, Answer::Kind::Away);
+    EXPECT_EQ(this->transport->awaitConfirmation(1ms).error().kind, Answer::Kind::Away);
     ASSERT_TRUE(this->transport->connect().isStored());
     this->transport->disconnect();
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::away);
+    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Away);
 }
 
 TYPED_TEST(TransportContract, aServerThatIsKilledInTheMiddleIsAwayAndTakesBatchesAgainWhenItIsBack)
@@ -155,7 +156,7 @@ TYPED_TEST(TransportContract, aServerThatIsKilledInTheMiddleIsAwayAndTakesBatche
     EXPECT_TRUE(this->transport->put("a", "1").isStored());
     this->fleet.kill();
     const Answer answer = this->transport->put("b", "2");
-    EXPECT_EQ(answer.kind, Answer::Kind::away);
+    EXPECT_EQ(answer.kind, Answer::Kind::Away);
     EXPECT_NE(answer.sentence, "");
     this->fleet.start();
     ASSERT_TRUE(this->transport->connect().isStored());
@@ -167,7 +168,7 @@ TYPED_TEST(TransportContract, aServerThatDoesNotAnswerIsAway)
 {
     ASSERT_TRUE(this->transport->connect().isStored());
     this->fleet.freeze(*this->transport);
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::away);
+    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Away);
 }
 
 TYPED_TEST(TransportContract, aFullStreamTakesNothingAndLaterTakesTheSameBatch)
@@ -176,7 +177,7 @@ TYPED_TEST(TransportContract, aFullStreamTakesNothingAndLaterTakesTheSameBatch)
     ASSERT_TRUE(this->transport->connect().isStored());
     const std::string batch(512 << 10, 'b');
     const Answer answer = this->transport->put("a", batch);
-    EXPECT_EQ(answer.kind, Answer::Kind::full);
+    EXPECT_EQ(answer.kind, Answer::Kind::Full);
     EXPECT_THAT(answer.sentence, HasSubstr("full"));
     this->fleet.drain();
     EXPECT_TRUE(this->transport->put("a", batch).isStored());
@@ -186,7 +187,7 @@ TYPED_TEST(TransportContract, aFullStreamTakesNothingAndLaterTakesTheSameBatch)
 TYPED_TEST(TransportContract, aWrongPasswordIsRefused)
 {
     const Answer answer = this->fleet.device(Credential::wrongPassword)->connect();
-    EXPECT_EQ(answer.kind, Answer::Kind::refused);
+    EXPECT_EQ(answer.kind, Answer::Kind::Refused);
     EXPECT_THAT(answer.sentence, HasSubstr("credentials file"));
 }
 
@@ -195,7 +196,7 @@ TYPED_TEST(TransportContract, aNameWithoutRightsOnItsSubjectIsRefusedAndStoresNo
     const auto forger = this->fleet.device(Credential::anothersSubject);
     ASSERT_TRUE(forger->connect().isStored());
     const Answer answer = forger->put("a", "1");
-    EXPECT_EQ(answer.kind, Answer::Kind::refused);
+    EXPECT_EQ(answer.kind, Answer::Kind::Refused);
     EXPECT_THAT(answer.sentence, HasSubstr("permissions"));
     EXPECT_THAT(this->fleet.stored(), IsEmpty());
 }
@@ -203,23 +204,23 @@ TYPED_TEST(TransportContract, aNameWithoutRightsOnItsSubjectIsRefusedAndStoresNo
 TYPED_TEST(TransportContract, theLastConfirmationOfTheDeviceIsTold)
 {
     ASSERT_TRUE(this->transport->connect().isStored());
-    EXPECT_EQ(this->transport->lastConfirmation(device), std::optional<Confirmation>());
+    EXPECT_EQ(this->transport->lastConfirmation(device).value(), std::nullopt);
     this->fleet.confirm(device, "aa", 5);
     this->fleet.confirm(device, "bb", 2);
     this->fleet.confirm(anotherDevice, "cc", 9);
-    EXPECT_EQ(this->transport->lastConfirmation(device), std::optional(Confirmation{"bb", 2}));
+    EXPECT_EQ(this->transport->lastConfirmation(device).value(), (Confirmation{"bb", 2}));
 }
 
 TYPED_TEST(TransportContract, aNewConfirmationOfTheDeviceIsAwaited)
 {
     this->fleet.confirm(device, "aa", 5);
     ASSERT_TRUE(this->transport->connect().isStored());
-    ASSERT_EQ(this->transport->lastConfirmation(device), std::optional(Confirmation{"aa", 5}));
-    EXPECT_EQ(this->transport->awaitConfirmation(20ms), std::optional<Confirmation>());
+    ASSERT_EQ(this->transport->lastConfirmation(device).value(), (Confirmation{"aa", 5}));
+    EXPECT_EQ(this->transport->awaitConfirmation(20ms).value(), std::nullopt);
     this->fleet.confirm(anotherDevice, "cc", 9);
     this->fleet.confirm(device, "aa", 6);
-    EXPECT_EQ(this->transport->awaitConfirmation(10s), std::optional(Confirmation{"aa", 6}));
-    EXPECT_EQ(this->transport->awaitConfirmation(20ms), std::optional<Confirmation>());
+    EXPECT_EQ(this->transport->awaitConfirmation(10s).value(), (Confirmation{"aa", 6}));
+    EXPECT_EQ(this->transport->awaitConfirmation(20ms).value(), std::nullopt);
 }
 
 TYPED_TEST(TransportContract, anInterruptionEndsACallThatWaitsAndAllLaterOnes)
@@ -230,10 +231,10 @@ TYPED_TEST(TransportContract, anInterruptionEndsACallThatWaitsAndAllLaterOnes)
         std::this_thread::sleep_for(50ms);
         this->transport->interrupt();
     });
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::interrupted);
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::interrupted);
-    EXPECT_EQ(this->transport->awaitConfirmation(1h).error().kind, Answer::Kind::interrupted);
-    EXPECT_EQ(this->transport->connect().kind, Answer::Kind::interrupted);
+    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(this->transport->awaitConfirmation(1h).error().kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(this->transport->connect().kind, Answer::Kind::Interrupted);
 }
 
 } // namespace
