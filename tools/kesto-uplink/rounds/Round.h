@@ -33,6 +33,7 @@ enum class Outcome : std::uint8_t {
     Away,
     Full,
     Refused,
+    Failed, // the device itself: its state or its store
     Interrupted,
 };
 
