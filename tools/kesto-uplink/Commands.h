@@ -17,6 +17,7 @@ void addPlaceOptions(CLI::App& command, Places& places);
 
 void addForgetCommand(CLI::App& application, int& exitStatus);
 void addPreviewCommand(CLI::App& application, int& exitStatus);
+void addRunCommand(CLI::App& application, int& exitStatus);
 void addStatusCommand(CLI::App& application, int& exitStatus);
 
 } // namespace kesto_uplink

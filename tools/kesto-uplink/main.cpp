@@ -17,6 +17,7 @@ int main(int argumentCount, char** arguments)
     int exitStatus = exitOk;
     kesto_uplink::addForgetCommand(application, exitStatus);
     kesto_uplink::addPreviewCommand(application, exitStatus);
+    kesto_uplink::addRunCommand(application, exitStatus);
     kesto_uplink::addStatusCommand(application, exitStatus);
     try {
         application.parse(argumentCount, arguments);

@@ -3,17 +3,17 @@
 #include "kesto-uplink/transport/Credentials.h"
 
 #include "platform/linux/files/FileDescriptor.h"
+#include "platform/linux/settings/TomlFile.h"
 
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/stat.h>
-#include <toml++/toml.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <array>
 #include <cerrno>
 #include <cstring>
+#include <map>
 #include <string_view>
 
 namespace kesto_uplink {
@@ -54,29 +54,27 @@ bool isToken(std::string_view name)
 
 Credentials readCredentials(const std::filesystem::path& file)
 {
-    const std::string text = contentsOf(file);
+    const auto values = platform::parseToml(contentsOf(file));
+    if (!values)
+        fail(file, fmt::format("is no TOML in line {}: {}", values.error().line, values.error().reason));
     Credentials credentials;
-    try {
-        for (const auto& [key, value] : toml::parse(text)) {
-            const auto word = value.value_exact<std::string>();
-            const auto isPlain = value.value_exact<bool>();
-            if (key == "plain" ? !isPlain : !word || word->empty())
-                fail(file, fmt::format("has a {} that is not {}", key.str(), key == "plain" ? "true or false" : "text"));
-            if (key == "plain")
-                credentials.isPlain = *isPlain;
-            else if (key == "name")
-                credentials.name = *word;
-            else if (key == "password")
-                credentials.password = *word;
-            else if (key == "key")
-                credentials.publicKey = *word;
-            else if (key == "seed")
-                credentials.seed = *word;
-            else
-                fail(file, fmt::format("has the unknown key {}: it takes name, password or key and seed, and plain", key.str()));
-        }
-    } catch (const toml::parse_error& error) {
-        fail(file, fmt::format("is no TOML in line {}: {}", error.source().begin.line, error.description()));
+    const std::map<std::string_view, std::string*> texts{{"name", &credentials.name},
+                                                         {"password", &credentials.password},
+                                                         {"key", &credentials.publicKey},
+                                                         {"seed", &credentials.seed}};
+    for (const auto& [key, value] : *values) {
+        const auto text = texts.find(key.view());
+        if (key.view() == "plain") {
+            if (value.kind() != foundation::Value::Kind::Number)
+                fail(file, "has a plain that is not true or false");
+            credentials.isPlain = value.asBoolean();
+        } else if (text == texts.end())
+            fail(file, fmt::format("has the unknown key {}: it takes name, password or key and seed, and plain",
+                                   key.view()));
+        else if (value.stringView().empty())
+            fail(file, fmt::format("has a {} that is not text", key.view()));
+        else
+            *text->second = value.stringView();
     }
     if (!isToken(credentials.name))
         fail(file, "needs a name of letters, digits, - and _");
