@@ -28,6 +28,7 @@
 #include <cstdlib>
 #include <future>
 #include <memory>
+#include <mutex>
 #include <optional>
 #include <random>
 #include <set>
@@ -73,33 +74,30 @@ private:
     Outbox outbox_;
 };
 
-// The parts of the service, connected.
+// Why the uplink may not run; nothing if it may.
+std::optional<std::string> reasonToBeOff(const Places& places, const CheckedUplinkConfiguration& checked)
+{
+    if (!checked.problems.empty())
+        return fmt::format("{}", fmt::join(checked.problems, "\n"));
+    if (!checked.configuration.enabled)
+        return fmt::format("off: nothing leaves this device without enabled = true in {}",
+                           places.configuration.native());
+    return std::nullopt;
+}
+
+// The parts of the service, connected. Each round reads the configuration anew, so that a change counts without a new
+// start.
 class Service {
 public:
-    Service(const Places& places, const UplinkConfiguration& configuration, const Credentials& credentials)
-        : places_(places), configuration_(configuration), state_(State::open(places.state, wallClock())),
-          patience_(places.state / "waiting-since"), sleep_(places.database),
-          transport_({.urls = configuration.servers, .authorities = configuration.ca}, credentials)
+    explicit Service(const Places& places)
+        : places_(places), state_(State::open(places.state, wallClock())), patience_(places.state / "waiting-since"),
+          sleep_(places.database)
     {
-        state_.noteOn(wallClock());
     }
 
     void run()
     {
-        const Terms terms{.forgetWhen = configuration_.forgetWhen,
-                          .maximumBytesADay = configuration_.maximumBytesADay,
-                          .pseudonymDays = configuration_.pseudonymDays,
-                          .hashKeyDays = configuration_.hashKeyDays};
-        Round round(
-            terms, state_, patience_, transport_,
-            [this](const Identity& identity) {
-                return std::make_unique<OutboxSource>(places_, configuration_, identity);
-            },
-            [this] { return Today{wallClock(), days_.day(wallClock(), uptime())}; }, [this] { return isMetered(); });
-        std::mt19937_64 generator(std::random_device{}());
-        Schedule schedule(configuration_.intervalSeconds,
-                          [&generator] { return std::uniform_real_distribution(0.0, 1.0)(generator); });
-        runRounds([&] { return guarded(round); }, schedule, sleep_,
+        runRounds([this] { return guardedRound(); }, schedule_, sleep_,
                   [this](const RoundResult& result) { report(result); });
     }
 
@@ -107,25 +105,60 @@ public:
     void end()
     {
         sleep_.end();
-        transport_.interrupt();
+        const std::scoped_lock lock(mutex_);
+        isEnding_ = true;
+        if (transport_)
+            transport_->interrupt();
     }
 
 private:
-    static RoundResult guarded(Round& round)
+    RoundResult guardedRound()
     {
         try {
-            return round.run();
+            return round();
         } catch (const StateError& error) {
             return {Outcome::Failed, error.what()};
         } catch (const EventStoreError& error) {
             return {Outcome::Failed, error.what()};
+        } catch (const CredentialsError& error) {
+            return {Outcome::Off, error.what()};
         }
+    }
+
+    RoundResult round()
+    {
+        const auto checked = readUplinkConfiguration(places_.configuration);
+        const UplinkConfiguration& configuration = checked.configuration;
+        if (auto reason = reasonToBeOff(places_, checked)) {
+            state_.noteOff();
+            return {Outcome::Off, *std::move(reason)};
+        }
+        state_.noteOn(wallClock());
+        schedule_.setInterval(configuration.intervalSeconds);
+        const auto transport = std::make_shared<JetStream>(
+            Servers{.urls = configuration.servers, .authorities = configuration.ca},
+            readCredentials(configuration.credentials));
+        {
+            const std::scoped_lock lock(mutex_);
+            if (isEnding_)
+                return {Outcome::Interrupted};
+            transport_ = transport;
+        }
+        return Round({.forgetWhen = configuration.forgetWhen,
+                      .maximumBytesADay = configuration.maximumBytesADay,
+                      .pseudonymDays = configuration.pseudonymDays,
+                      .hashKeyDays = configuration.hashKeyDays},
+                     state_, patience_, *transport,
+                     [&](const Identity& identity) {
+                         return std::make_unique<OutboxSource>(places_, configuration, identity);
+                     },
+                     [this] { return Today{wallClock(), days_.day(wallClock(), uptime())}; },
+                     [&] { return !configuration.metered && isMetered(); })
+            .run();
     }
 
     bool isMetered()
     {
-        if (configuration_.metered)
-            return false;
         const Metered metered = networkIsMetered();
         if (metered == Metered::Unknown && !std::exchange(saidUnknown_, true))
             log("NetworkManager does not say whether the network is metered: it counts as not metered");
@@ -146,14 +179,19 @@ private:
     }
 
     Places places_;
-    UplinkConfiguration configuration_;
     State state_;
     Patience patience_;
     StoreSleep sleep_;
-    JetStream transport_;
+    std::mt19937_64 generator_{std::random_device{}()};
+    Schedule schedule_{UplinkConfiguration().intervalSeconds,
+                       [this] { return std::uniform_real_distribution(0.0, 1.0)(generator_); }};
     DayCount days_;
     Diary diary_;
     bool saidUnknown_ = false;
+
+    std::mutex mutex_; // of the two below
+    bool isEnding_ = false;
+    std::shared_ptr<JetStream> transport_; // of the last round
 };
 
 sigset_t endingSignals()
@@ -165,11 +203,11 @@ sigset_t endingSignals()
     return signals;
 }
 
-int serve(const Places& places, const UplinkConfiguration& configuration, const Credentials& credentials)
+int serve(const Places& places)
 {
     const sigset_t signals = endingSignals();
     ::pthread_sigmask(SIG_BLOCK, &signals, nullptr); // in all threads to come
-    Service service(places, configuration, credentials);
+    Service service(places);
     ::sd_notify(0, "READY=1\nSTATUS=waiting for the first round");
     auto rounds = std::async(std::launch::async, [&service] {
         try {
@@ -192,22 +230,20 @@ int serve(const Places& places, const UplinkConfiguration& configuration, const 
 int run(const Places& places)
 {
     const auto checked = readUplinkConfiguration(places.configuration);
-    for (const std::string& problem : checked.problems)
-        log(problem);
-    if (!checked.problems.empty())
-        return EX_CONFIG;
-    if (!checked.configuration.enabled) {
-        log(fmt::format("off: nothing leaves this device without enabled = true in {}", places.configuration.native()));
+    if (const auto reason = reasonToBeOff(places, checked)) {
+        log(*reason);
         if (auto state = State::openPresent(places.state))
             state->noteOff();
-        return exitOk;
+        ::sd_notify(0, "READY=1\nSTATUS=off"); // a unit that ends without it has failed
+        return checked.problems.empty() ? exitOk : EX_CONFIG;
     }
     try {
-        return serve(places, checked.configuration, readCredentials(checked.configuration.credentials));
+        static_cast<void>(readCredentials(checked.configuration.credentials));
     } catch (const CredentialsError& error) {
         log(error.what());
         return EX_CONFIG;
     }
+    return serve(places);
 }
 
 } // namespace

@@ -34,6 +34,7 @@ enum class Outcome : std::uint8_t {
     Full,
     Refused,
     Failed, // the device itself: its state or its store
+    Off, // by the configuration
     Interrupted,
 };
 

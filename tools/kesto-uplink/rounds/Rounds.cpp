@@ -22,11 +22,12 @@ void runRounds(const std::function<RoundResult()>& round, Schedule& schedule, Sl
     }
 }
 
-// The servers of a list fail in turn with different words, so only the words of a refusal matter.
+// The servers of a list are away in turn, and the bytes of a day are others each day: there only the kind matters.
 std::optional<std::string> Diary::line(const RoundResult& result)
 {
-    const bool isNew = result.outcome != lastOutcome_
-        || ((result.outcome == Outcome::Refused || result.outcome == Outcome::Sent) && result.sentence != last_);
+    const bool isLasting = result.outcome == Outcome::Away || result.outcome == Outcome::Full
+        || result.outcome == Outcome::DayUsedUp;
+    const bool isNew = result.outcome != lastOutcome_ || (!isLasting && result.sentence != last_);
     if (result.outcome == Outcome::Nothing || !isNew)
         return std::nullopt;
     lastOutcome_ = result.outcome;

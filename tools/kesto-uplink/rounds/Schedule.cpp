@@ -31,6 +31,7 @@ double Schedule::untilNextRound(Outcome last)
     case Outcome::Sent:
     case Outcome::Waiting:
     case Outcome::Metered:
+    case Outcome::Off:
     case Outcome::Interrupted: failures_ = 0; return interval_;
     case Outcome::DayUsedUp: failures_ = 0; return std::max(interval_, hour);
     case Outcome::Away:
@@ -48,7 +49,7 @@ double Schedule::untilNextRound(Outcome last)
 
 bool Schedule::needsNews(Outcome last) noexcept
 {
-    return last == Outcome::Nothing || last == Outcome::Sent;
+    return last == Outcome::Nothing || last == Outcome::Sent || last == Outcome::Off;
 }
 
 std::int64_t DayCount::day(double now, double uptime)

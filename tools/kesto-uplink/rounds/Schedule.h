@@ -17,6 +17,8 @@ public:
     // `random` gives numbers from 0 up to 1.
     Schedule(double interval, std::function<double()> random) : interval_(interval), random_(std::move(random)) { }
 
+    void setInterval(double interval) { interval_ = interval; }
+
     [[nodiscard]] double untilFirstRound();
     [[nodiscard]] double untilNextRound(Outcome last);
     // Whether there is no reason for the next round before the store has something new.

@@ -10,6 +10,7 @@
 #include <string>
 #include <vector>
 
+namespace uplink_test {
 namespace {
 
 using namespace kesto_uplink;
@@ -20,7 +21,7 @@ constexpr double interval = 900;
 TEST(Schedule, aRoundThatWentWellWaitsAnIntervalAndThenForNews)
 {
     Schedule schedule(interval, [] { return 0.5; });
-    for (const Outcome outcome : {Outcome::Sent, Outcome::Nothing}) {
+    for (const Outcome outcome : {Outcome::Sent, Outcome::Nothing, Outcome::Off}) {
         EXPECT_EQ(schedule.untilNextRound(outcome), 900);
         EXPECT_TRUE(Schedule::needsNews(outcome));
     }
@@ -156,3 +157,4 @@ TEST(Rounds, anInterruptionEndsThem)
 }
 
 } // namespace
+} // namespace uplink_test

@@ -8,6 +8,7 @@
 #include <chrono>
 #include <future>
 
+namespace uplink_test {
 namespace {
 
 using kesto_uplink::StoreSleep;
@@ -59,3 +60,4 @@ TEST(StoreSleep, withoutAFolderItLooksAgainAfterEachInterval)
 }
 
 } // namespace
+} // namespace uplink_test

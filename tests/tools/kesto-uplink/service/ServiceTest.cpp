@@ -93,10 +93,11 @@ protected:
     // Waits until the uplink has an answer to all that is in the store.
     bool isAllQueued()
     {
-        const std::string newest = kestod.query("SELECT epoch || ':' || max(id) FROM store, events").at(0);
+        const std::string newest = "SELECT epoch || ':' || (next_event - 1) FROM store";
         return waitUntil([&] {
-            const auto queued = kesto_uplink::State::openPresent(uplink.state())->queued();
-            return fmt::format("{}:{}", queued.epoch, queued.id) == newest;
+            auto state = kesto_uplink::State::openPresent(uplink.state());
+            const auto queued = state ? state->queued() : kesto_uplink::Cursor();
+            return fmt::format("{}:{}", queued.epoch, queued.id) == kestod.query(newest).at(0);
         });
     }
 
@@ -142,7 +143,7 @@ TEST_F(UplinkService, WhatIsAllowedIsInTheStreamOnceWhateverIsKilled)
     report(20);
     ASSERT_TRUE(isAllQueued());
     expected.merge(keysInStore());
-    EXPECT_EQ(expected.size(), 120U); // each message becomes two events
+    EXPECT_GE(expected.size(), 120U); // each message becomes two events
     EXPECT_EQ(keysInStream(), expected);
 
     // The fleet's store has it all: the device forgets.
@@ -175,9 +176,9 @@ TEST_F(UplinkService, KillsAtRandomLoseNothing)
     ASSERT_TRUE(isAllQueued());
     static_cast<void>(messageIDs());
     const Keys stream = keysInStream();
-    EXPECT_EQ(std::set<std::string>(stream.begin(), stream.end()).size(), 80U);
     const Keys store = keysInStore();
-    EXPECT_TRUE(std::ranges::includes(stream, store));
+    EXPECT_GE(store.size(), 80U); // each message becomes two events
+    EXPECT_EQ(std::set(stream.begin(), stream.end()), std::set(store.begin(), store.end()));
 }
 
 TEST_F(UplinkService, ASignalEndsItAlsoWhileItWaitsForAnAnswer)
@@ -197,6 +198,24 @@ TEST_F(UplinkService, WithoutEnabledItSaysSoAndEnds)
     EXPECT_EQ(uplink.exitStatus(), 0);
     EXPECT_THAT(uplink.log(), StartsWith("kesto-uplink: off: "));
     EXPECT_FALSE(std::filesystem::exists(uplink.state() / kesto_uplink::State::fileName));
+}
+
+TEST_F(UplinkService, AChangeOfItsFilesCountsFromTheNextRoundOn)
+{
+    proxy.holdNoMore();
+    report(5);
+    uplink.start();
+    ASSERT_TRUE(isAllQueued());
+    const Keys before = keysInStream();
+    const std::string configuration = support::readFile(uplink.state() / "uplink.toml");
+    uplink.writeConfiguration("enabled = false\n");
+    report(5);
+    ASSERT_TRUE(waitUntil([this] { return uplink.log().contains("off: "); }));
+    EXPECT_EQ(keysInStream(), before);
+    uplink.writeConfiguration(configuration);
+    report(5);
+    EXPECT_TRUE(isAllQueued());
+    EXPECT_EQ(keysInStream(), keysInStore());
 }
 
 TEST_F(UplinkService, AMistakeInItsFilesEndsItWithASentence)

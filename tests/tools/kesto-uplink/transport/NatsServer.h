@@ -28,7 +28,7 @@ struct StoredMessage {
 class NatsServer {
 public:
     struct Setup {
-        std::string tls; // the inner lines of a block `tls`, or nothing
+        std::string tls = {}; // the inner lines of a block `tls`, or nothing
         bool hasStreams = true;
     };
 
