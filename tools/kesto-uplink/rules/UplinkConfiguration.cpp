@@ -151,7 +151,7 @@ public:
         std::ranges::stable_sort(to_.configuration.allowed.events, {}, &EventRules::line);
         to_.configuration.allowed.stretches = readColumns(values, "stretches", stretchColumns);
         to_.configuration.allowed.sessions = readColumns(values, "sessions", sessionColumns);
-        if (to_.configuration.enabled && to_.configuration.servers.empty() && !values.contains("servers"))
+        if (to_.configuration.enabled && to_.configuration.servers.empty() && to_.problems.empty())
             problem({"enabled"}, "without servers nothing can leave: add servers = [\"tls://HOST:4222\"], or set "
                                  "enabled = false");
     }
