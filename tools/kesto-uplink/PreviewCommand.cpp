@@ -131,7 +131,8 @@ private:
         fmt::print(stderr, "{} rows in {} batches would leave, compressed to {}.\n", sum_.rows, sum_.batches,
                    sizeText(static_cast<std::uint64_t>(sum_.bytes)));
         explain(sum_.leftOut.notAllowed, "stay, because no rule allows them");
-        explain(sum_.leftOut.unreadable, "cannot leave, because their payload is no JSON object, or has a number that JSON has not");
+        explain(sum_.leftOut.unreadable,
+                "cannot leave, because their payload is no JSON object, or has a number that JSON has not");
         explain(sum_.leftOut.tooLarge, "cannot leave, because each alone is larger than a batch may be");
         if (sum_.leftOut.lostToAge > 0)
             fmt::print(stderr, "{} rows are lost: the event store removed them before they could leave.\n",
@@ -201,8 +202,10 @@ void addPreviewCommand(CLI::App& application, int& exitStatus)
     command->add_flag("--json", options->isJson, "On standard error one JSON object, for programs");
     command->callback([options, &exitStatus] {
         if (!options->since.empty() && !parseMoment(options->since))
-            throw CLI::ValidationError("--since", "\"" + options->since + "\" is neither so long ago, such as 10m, "
-                                                  "nor a time such as 2026-01-31T18:00:00");
+            throw CLI::ValidationError("--since",
+                                       "\"" + options->since
+                                           + "\" is neither so long ago, such as 10m, "
+                                             "nor a time such as 2026-01-31T18:00:00");
         exitStatus = Preview(*options).run();
     });
 }

@@ -138,8 +138,9 @@ TEST_F(UplinkCommands, PreviewWorksWhileTheUplinkIsOff)
     configure("[events.\"com.quarn.kesto.*\"]\nkey = \"keep\"\n");
     const Finished preview = run({"preview"});
     EXPECT_THAT(preview.output, HasSubstr(R"("payload":{"key":1})"));
-    EXPECT_THAT(preview.errors, StartsWith("The uplink is off: " + configuration.native()
-                                           + " does not say enabled = true. This would leave if it was on.\n"));
+    EXPECT_THAT(preview.errors,
+                StartsWith("The uplink is off: " + configuration.native()
+                           + " does not say enabled = true. This would leave if it was on.\n"));
     std::filesystem::remove(configuration);
     EXPECT_EQ(run({"preview"}).output, "");
     EXPECT_EQ(run({"preview"}).status, 0);
@@ -156,10 +157,11 @@ TEST_F(UplinkCommands, PreviewExplainsItselfToPrograms)
     EXPECT_EQ(explained.find("rows")->text(), "1");
     EXPECT_EQ(explained.find("not_allowed")->text(), R"({"a":2})");
     EXPECT_EQ(explained.find("lost_to_age")->text(), "0");
-    EXPECT_EQ(explained.find("suspects")->text(),
-              R"([")" + configuration.native()
-                  + R"(:5: no event that matches \"com.quarn.kesto.*\" had the key \"kye\" among the newest in the event )"
-                    R"(store: correct the line, or remove it"])");
+    EXPECT_EQ(
+        explained.find("suspects")->text(),
+        R"([")" + configuration.native()
+            + R"(:5: no event that matches \"com.quarn.kesto.*\" had the key \"kye\" among the newest in the event )"
+              R"(store: correct the line, or remove it"])");
 }
 
 TEST_F(UplinkCommands, NothingIsPreviewedOfAWrongConfiguration)
@@ -177,8 +179,8 @@ TEST_F(UplinkCommands, NothingIsPreviewedOfAWrongConfiguration)
                     "kesto-uplink: nothing leaves until this is corrected\n");
     const Finished finished = run({"status"});
     EXPECT_EQ(finished.status, 1);
-    EXPECT_THAT(finished.output, StartsWith("uplink       off: nothing leaves until " + configuration.native()
-                                            + " is corrected\n"));
+    EXPECT_THAT(finished.output,
+                StartsWith("uplink       off: nothing leaves until " + configuration.native() + " is corrected\n"));
     EXPECT_THAT(finished.output, HasSubstr(":5: other = kep is no rule"));
 }
 
@@ -187,8 +189,9 @@ TEST_F(UplinkCommands, NeedsAnEventStore)
     configure(rules);
     const Finished preview = run({"preview"});
     EXPECT_EQ(preview.status, 1);
-    EXPECT_EQ(preview.errors, "kesto-uplink: the event store " + database.native()
-                                  + " does not exist: has kestod run? Name another with --database\n");
+    EXPECT_EQ(preview.errors,
+              "kesto-uplink: the event store " + database.native()
+                  + " does not exist: has kestod run? Name another with --database\n");
     EXPECT_THAT(run({"status"}).output, HasSubstr("does not exist: has kestod run?"));
 }
 
@@ -210,13 +213,15 @@ TEST_F(UplinkCommands, StatusSaysWhatWasSentAndWhatWaits)
     }
     const std::string text = run({"status"}).output;
     EXPECT_THAT(text, StartsWith("uplink       on since 2023-11-14 22:14:10\npseudonym    "));
-    EXPECT_THAT(text, HasSubstr(" since 2023-11-14 22:13:20\n"
-                                "sent         9 rows in 1 batches, 700 B; 0 B today; 1 retries\n"
-                                "stored       up to ID 5; sent up to ID 12\n"
-                                "left out     3 rows that may not leave; 2 lost to age\n"
-                                "waiting      8 rows, "));
-    EXPECT_THAT(text, HasSubstr("; the oldest since 2023-11-14 22:13:32\n"
-                                "last answer  2023-11-14 22:14:20: the stream is full\n"));
+    EXPECT_THAT(text,
+                HasSubstr(" since 2023-11-14 22:13:20\n"
+                          "sent         9 rows in 1 batches, 700 B; 0 B today; 1 retries\n"
+                          "stored       up to ID 5; sent up to ID 12\n"
+                          "left out     3 rows that may not leave; 2 lost to age\n"
+                          "waiting      8 rows, "));
+    EXPECT_THAT(text,
+                HasSubstr("; the oldest since 2023-11-14 22:13:32\n"
+                          "last answer  2023-11-14 22:14:20: the stream is full\n"));
     const auto json = status();
     EXPECT_EQ(json.find("on")->text(), "1");
     EXPECT_EQ(json.find("on_since")->text(), "1700000050");

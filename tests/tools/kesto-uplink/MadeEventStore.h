@@ -34,8 +34,9 @@ public:
     void setEpoch(std::string_view epoch) { execute(fmt::format("UPDATE store SET epoch = '{}'", epoch)); }
 
     // A message with this name, and a second one if there is one. Returns its ID, which is the next.
-    std::int64_t addEvent(std::string_view name, std::string_view payload = "{}", std::optional<std::int64_t> session = {},
-                          double time = 1000, std::string_view secondName = {})
+    std::int64_t addEvent(std::string_view name, std::string_view payload = "{}",
+                          std::optional<std::int64_t> session = {}, double time = 1000,
+                          std::string_view secondName = {})
     {
         const std::int64_t id = next();
         const std::string second = secondName.empty() ? "NULL" : quoted(secondName);

@@ -74,13 +74,17 @@ struct Made {
     {
         MadeEventStore store(database);
         const int rows = *rc::gen::inRange(0, 40);
+        store.execute("BEGIN");
         for (int row = 0; row < rows; ++row)
             add(store);
+        store.execute("COMMIT");
     }
 
     // Whether the row may leave, by the globs of the configuration.
     [[nodiscard]] bool leaves(const std::string& name) const
     {
+        if (name.empty())
+            return false;
         if (name == "stretch")
             return configuration.allowed.stretches.has_value();
         return std::ranges::any_of(configuration.allowed.events, [&name](const auto& table) {

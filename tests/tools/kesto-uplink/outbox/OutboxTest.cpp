@@ -228,7 +228,8 @@ TEST_F(UplinkOutbox, NeverMakesABatchThatIsTooLarge)
             tooLarge += count;
     }
     EXPECT_EQ(tooLarge, 1);
-    EXPECT_THAT(keysIn(batches), ElementsAre("event 1", "event 2", "event 3", "event 4", "event 6", "event 7", "event 8"));
+    EXPECT_THAT(keysIn(batches),
+                ElementsAre("event 1", "event 2", "event 3", "event 4", "event 6", "event 7", "event 8"));
     EXPECT_EQ(batches.back().last.id, 8);
     Outbox whole = outbox({.wholeBytes = 3000});
     EXPECT_THAT(keysIn(allBatches(whole)), SizeIs(7));

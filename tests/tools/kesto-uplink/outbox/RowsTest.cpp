@@ -29,7 +29,8 @@ UplinkConfiguration configuration()
 
 const std::string epoch = "ffffffffffffffff0000000000000000";
 const std::string player = "org.example.player";
-constexpr const char* begin = R"({"device":"00112233445566778899aabbccddeeff","epoch":"ffffffffffffffff0000000000000000",)";
+constexpr const char* begin =
+    R"({"device":"00112233445566778899aabbccddeeff","epoch":"ffffffffffffffff0000000000000000",)";
 
 TEST(Rows, WritesAnEvent)
 {
@@ -47,8 +48,9 @@ TEST(Rows, WritesAnEvent)
                     R"("payload":{"HostApplicationDisplayID":"a\"b","latency":0.1}})"
                     "\n");
     EXPECT_EQ(rows.event({.id = 8, .time = 5, .name = "com.quarn.kesto.x", .payload = "{}"}, epoch, nullptr),
-              std::string(begin) + R"("kind":"event","id":8,"time":5,"name":"com.quarn.kesto.x","payload":{}})"
-                                   "\n");
+              std::string(begin)
+                  + R"("kind":"event","id":8,"time":5,"name":"com.quarn.kesto.x","payload":{}})"
+                    "\n");
 }
 
 TEST(Rows, NamesTheApplicationOfTheSessionIfThatMayLeave)
@@ -67,7 +69,8 @@ TEST(Rows, KeepsTheDigitsOfNumbers)
     Rows rows(configuration(), identity());
     const auto payloadOf = [&rows](const std::string& number) {
         const std::string line =
-            rows.event({.id = 1, .name = "com.quarn.kesto.x", .payload = R"({"latency":)" + number + "}"}, epoch, nullptr)
+            rows.event({.id = 1, .name = "com.quarn.kesto.x", .payload = R"({"latency":)" + number + "}"}, epoch,
+                       nullptr)
                 .value();
         return line.substr(line.find("\"latency\":") + 10);
     };
@@ -83,10 +86,11 @@ TEST(Rows, KeepsBackWhatItCannotRead)
 {
     Rows rows(configuration(), identity());
     const auto why = [&rows](const std::string& payload, double time = 5) {
-        return rows.event({.id = 1, .time = time, .name = "com.quarn.kesto.x", .payload = payload}, epoch, nullptr).error();
+        return rows.event({.id = 1, .time = time, .name = "com.quarn.kesto.x", .payload = payload}, epoch, nullptr)
+            .error();
     };
-    for (const char* broken : {"", "[]", "1", "null", "{", "{\"a\":}", "{\"a\":1}x", "{\"a\":1e999}", "{\"a\":\"\xFF\"}",
-                               "{\"a\":NaN}"})
+    for (const char* broken :
+         {"", "[]", "1", "null", "{", "{\"a\":}", "{\"a\":1}x", "{\"a\":1e999}", "{\"a\":\"\xFF\"}", "{\"a\":NaN}"})
         EXPECT_EQ(why(broken), WhyNot::Unreadable) << broken;
     EXPECT_EQ(why("{\"latency\":" + std::string(100'000, '[') + std::string(100'000, ']') + "}"), WhyNot::Unreadable);
     EXPECT_EQ(why(std::string(1'000'000, '{')), WhyNot::Unreadable);
@@ -137,8 +141,9 @@ TEST(Rows, WritesASession)
                                 .began = 1000.5,
                                 .ended = 1010};
     EXPECT_EQ(Rows(with, identity()).session(session, epoch),
-              std::string(begin) + R"("kind":"session","id":3,"began":1000.5,"ended":1010})"
-                                   "\n");
+              std::string(begin)
+                  + R"("kind":"session","id":3,"began":1000.5,"ended":1010})"
+                    "\n");
     for (const char* column : {"reporter", "service", "process"})
         with.allowed.sessions->push_back({.key = column, .action = Action::Keep});
     with.allowed.sessions->push_back({.key = "application", .action = Action::Drop});
@@ -153,8 +158,9 @@ TEST(Rows, BeginsABatchWithTheDevice)
 {
     UplinkConfiguration with;
     EXPECT_EQ(Rows(with, identity()).device({epoch, 11}, {epoch, 20}, 1700000000.5),
-              std::string(begin) + R"("kind":"device","sent":1700000000.5,"first":11,"last":20})"
-                                   "\n");
+              std::string(begin)
+                  + R"("kind":"device","sent":1700000000.5,"first":11,"last":20})"
+                    "\n");
     with.model = "speaker 2";
     with.version = "7.1";
     EXPECT_EQ(Rows(with, identity()).device({epoch, 11}, {epoch, 20}, 1700000000.5),

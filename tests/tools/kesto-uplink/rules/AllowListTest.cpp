@@ -79,7 +79,8 @@ TEST(AllowList, PutsNumbersIntoBuckets)
 TEST(AllowList, KeepsBackWhatIsNoNumberWhereABucketIsAskedFor)
 {
     const std::vector<Rule> rules = {{.key = "a", .action = Action::Bucket, .edges = {1}}};
-    for (const char* json : {R"({"a": "5"})", R"({"a": true})", R"({"a": null})", R"({"a": [5]})", R"({"a": {"b": 5}})"})
+    for (const char* json :
+         {R"({"a": "5"})", R"({"a": true})", R"({"a": null})", R"({"a": [5]})", R"({"a": {"b": 5}})"})
         EXPECT_EQ(left(rules, json), Dictionary()) << json;
     Filter filter(withRules(rules), hashKey);
     EXPECT_EQ(filter.event("com.quarn.kesto.x", Dictionary{{"a", std::numeric_limits<double>::quiet_NaN()}}),
@@ -104,11 +105,12 @@ TEST(AllowList, AppliesTheRuleThatStandsLastInTheFile)
 
 TEST(AllowList, TreatsColumnsAsNumbersAndTexts)
 {
-    const Filter filter({.stretches = std::vector<Rule>{{.key = "device", .action = Action::Hash},
-                                                        {.key = "format", .action = Action::Keep},
-                                                        {.key = "volume", .action = Action::Bucket, .edges = {0.25, 0.5}},
-                                                        {.key = "channels", .action = Action::Drop}}},
-                        hashKey);
+    const Filter filter(
+        {.stretches = std::vector<Rule>{{.key = "device", .action = Action::Hash},
+                                        {.key = "format", .action = Action::Keep},
+                                        {.key = "volume", .action = Action::Bucket, .edges = {0.25, 0.5}},
+                                        {.key = "channels", .action = Action::Drop}}},
+        hashKey);
     EXPECT_TRUE(filter.allowsStretches());
     EXPECT_FALSE(filter.allowsSessions());
     EXPECT_EQ(filter.ofStretch("device", fox), Value("hash-f7bc83f430538424"));

@@ -4,8 +4,11 @@
 
 #include "support/TemporaryDirectory.h"
 
+#include <fstream>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <iterator>
+#include <regex>
 
 namespace kesto_uplink {
 namespace {
@@ -121,7 +124,8 @@ TEST(UplinkConfiguration, SaysWhatAValueShouldBe)
     EXPECT_THAT(problems("\ninterval = 0\n"),
                 ElementsAre("/etc/kesto/uplink.toml:2: interval = 0 should be a number of seconds above 0, a week at "
                             "most"));
-    EXPECT_THAT(problems("servers = [\"reports.example\"]"), ElementsAre(StartsWith("/etc/kesto/uplink.toml:1: servers")));
+    EXPECT_THAT(problems("servers = [\"reports.example\"]"),
+                ElementsAre(StartsWith("/etc/kesto/uplink.toml:1: servers")));
     EXPECT_THAT(problems("servers = \"tls://reports.example\""), SizeIs(1));
     EXPECT_THAT(problems("enabled = 1"), SizeIs(1));
     EXPECT_THAT(problems("forget = \"sent\""), SizeIs(1));
@@ -191,6 +195,30 @@ TEST(UplinkConfiguration, ReadsAFile)
     support::writeFile(directory / "uplink.toml", "[device]\nmodel = \"m\"\n");
     EXPECT_EQ(readUplinkConfiguration(directory / "uplink.toml").configuration.model, "m");
     EXPECT_THAT(readUplinkConfiguration(directory.path()).problems, SizeIs(1));
+}
+
+// As a maker begins: with the example, and the signs of its commented lines removed.
+TEST(UplinkConfiguration, ReadsItsExample)
+{
+    std::ifstream stream(KESTO_EXAMPLES "/uplink.toml");
+    const std::string text{std::istreambuf_iterator(stream), {}};
+    const auto shown = parse(text);
+    EXPECT_THAT(shown.problems, IsEmpty());
+    EXPECT_FALSE(shown.isOn());
+    EXPECT_EQ(shown.configuration.pseudonymDays, UplinkConfiguration().pseudonymDays);
+    EXPECT_EQ(shown.configuration.hashKeyDays, UplinkConfiguration().hashKeyDays);
+    EXPECT_EQ(shown.configuration.intervalSeconds, UplinkConfiguration().intervalSeconds);
+    EXPECT_EQ(shown.configuration.maximumBytesADay, UplinkConfiguration().maximumBytesADay);
+    EXPECT_THAT(shown.configuration.allowed.events, IsEmpty());
+
+    const auto whole = parse(std::regex_replace(text, std::regex("(^|\n)#(?=[a-zA-Z\\[])"), "$1"));
+    EXPECT_THAT(whole.problems, IsEmpty());
+    EXPECT_THAT(whole.configuration.servers, ElementsAre("tls://reports.example:4222"));
+    EXPECT_EQ(whole.configuration.model, "speaker-2");
+    ASSERT_THAT(whole.configuration.allowed.events, SizeIs(2));
+    EXPECT_THAT(whole.configuration.allowed.events[0].rules, SizeIs(3));
+    EXPECT_THAT(*whole.configuration.allowed.stretches, SizeIs(3));
+    EXPECT_THAT(*whole.configuration.allowed.sessions, SizeIs(2));
 }
 
 } // namespace
