@@ -31,8 +31,7 @@ void addPlaceOptions(CLI::App& command, Places& places)
 {
     places = usualPlaces();
     command.add_option("--configuration", places.configuration, "The rules, if they are not in /etc/kesto/uplink.toml");
-    command.add_option("--database", places.database,
-                       "The event store, if it is not /var/lib/kesto/analytics.sqlite3");
+    command.add_option("--database", places.database, "The event store, if it is not /var/lib/kesto/analytics.sqlite3");
     command.add_option("--state", places.state,
                        "The directory of the uplink's state, if it is not /var/lib/kesto-uplink");
 }

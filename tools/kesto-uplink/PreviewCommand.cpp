@@ -124,15 +124,16 @@ private:
     void explain() const
     {
         if (!checked_.configuration.enabled)
-            fmt::print(stderr, "The uplink is off: {} does not say enabled = true. If it was on, this would leave.\n",
+            fmt::print(stderr, "The uplink is off: {} does not say enabled = true. This would leave if it was on.\n",
                        options_.places.configuration.native());
         if (!hint_.empty())
             fmt::print(stderr, "{}.\n", hint_);
-        fmt::print(stderr, "{} rows in {} batches would leave: {} as they are, compressed.\n", sum_.rows, sum_.batches,
+        fmt::print(stderr, "{} rows in {} batches would leave, compressed to {}.\n", sum_.rows, sum_.batches,
                    sizeText(static_cast<std::uint64_t>(sum_.bytes)));
-        explain(sum_.leftOut.notAllowed, "stay: no rule allows them");
-        explain(sum_.leftOut.unreadable, "cannot leave: their payload is no JSON object, or has an impossible number");
-        explain(sum_.leftOut.tooLarge, "cannot leave: each alone is larger than a batch may be");
+        explain(sum_.leftOut.notAllowed, "stay, because no rule allows them");
+        explain(sum_.leftOut.unreadable,
+                "cannot leave, because their payload is no JSON object, or has a number that JSON has not");
+        explain(sum_.leftOut.tooLarge, "cannot leave, because each alone is larger than a batch may be");
         if (sum_.leftOut.lostToAge > 0)
             fmt::print(stderr, "{} rows are lost: the event store removed them before they could leave.\n",
                        sum_.leftOut.lostToAge);
@@ -173,7 +174,7 @@ private:
     {
         Dictionary::Entries entries;
         for (const auto& [name, count] : counts)
-            entries.push_back({name, count});
+            entries.push_back({foundation::String(name), count});
         return Dictionary(std::move(entries));
     }
 
@@ -201,8 +202,10 @@ void addPreviewCommand(CLI::App& application, int& exitStatus)
     command->add_flag("--json", options->isJson, "On standard error one JSON object, for programs");
     command->callback([options, &exitStatus] {
         if (!options->since.empty() && !parseMoment(options->since))
-            throw CLI::ValidationError("--since", "\"" + options->since + "\" is neither so long ago, such as 10m, "
-                                                  "nor a time such as 2026-01-31T18:00:00");
+            throw CLI::ValidationError("--since",
+                                       "\"" + options->since
+                                           + "\" is neither so long ago, such as 10m, "
+                                             "nor a time such as 2026-01-31T18:00:00");
         exitStatus = Preview(*options).run();
     });
 }

@@ -153,10 +153,11 @@ private:
                                 size(waiting_->bytes),
                                 waiting_->oldest ? "; the oldest since " + momentText(*waiting_->oldest) : "");
         if (remembered_)
-            text += fmt::format("last answer  {}\n",
-                                remembered_->lastAnswer ? fmt::format("{}: {}", momentText(remembered_->lastAnswer->time),
-                                                                      printable(remembered_->lastAnswer->text))
-                                                        : "none");
+            text +=
+                fmt::format("last answer  {}\n",
+                            remembered_->lastAnswer ? fmt::format("{}: {}", momentText(remembered_->lastAnswer->time),
+                                                                  printable(remembered_->lastAnswer->text))
+                                                    : "none");
         for (const auto* const sentences : {&problems_, &suspects_})
             for (const std::string& sentence : *sentences)
                 text += sentence + '\n';
@@ -180,13 +181,15 @@ private:
             entries.push_back({"on_since", valueOf(known.onSince)});
             entries.push_back({"pseudonym", known.identity.pseudonym});
             entries.push_back({"pseudonym_since", known.identity.pseudonymBorn});
-            entries.push_back({"sent", Dictionary{{"rows", known.totals.rows},
-                                                  {"batches", known.totals.batches},
-                                                  {"bytes", known.totals.bytes},
-                                                  {"bytes_today", known.bytesToday},
-                                                  {"retries", known.totals.retries}}});
-            entries.push_back({"left_out", Dictionary{{"not_allowed", known.totals.notAllowed},
-                                                      {"lost_to_age", known.totals.lostToAge}}});
+            entries.push_back({"sent",
+                               Dictionary{{"rows", known.totals.rows},
+                                          {"batches", known.totals.batches},
+                                          {"bytes", known.totals.bytes},
+                                          {"bytes_today", known.bytesToday},
+                                          {"retries", known.totals.retries}}});
+            entries.push_back(
+                {"left_out",
+                 Dictionary{{"not_allowed", known.totals.notAllowed}, {"lost_to_age", known.totals.lostToAge}}});
             entries.push_back({"queued", placeOf(known.queued)});
             entries.push_back({"stored", placeOf(known.stored)});
             entries.push_back({"last_answer",
@@ -195,10 +198,11 @@ private:
                                                 : Value()});
         }
         if (waiting_)
-            entries.push_back({"waiting", Dictionary{{"rows", waiting_->rows},
-                                                     {"bytes", waiting_->bytes},
-                                                     {"more", waiting_->areMore},
-                                                     {"oldest", valueOf(waiting_->oldest)}}});
+            entries.push_back({"waiting",
+                               Dictionary{{"rows", waiting_->rows},
+                                          {"bytes", waiting_->bytes},
+                                          {"more", waiting_->areMore},
+                                          {"oldest", valueOf(waiting_->oldest)}}});
         std::string line;
         foundation::appendJsonText(Dictionary(std::move(entries)), line);
         return line + '\n';

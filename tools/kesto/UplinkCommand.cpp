@@ -25,9 +25,9 @@ constexpr const char* program = "kesto-uplink";
     const auto beside = std::filesystem::read_symlink("/proc/self/exe", error).parent_path() / program;
     ::execv(beside.c_str(), arguments.data());
     ::execvp(program, arguments.data());
-    throw std::runtime_error(errno == ENOENT
-                                 ? "kesto uplink needs kesto-uplink, which is not installed: install that package"
-                                 : fmt::format("cannot start kesto-uplink: {}", std::generic_category().message(errno)));
+    throw std::runtime_error(
+        errno == ENOENT ? "kesto uplink needs kesto-uplink, which is not installed: install that package"
+                        : fmt::format("cannot start kesto-uplink: {}", std::generic_category().message(errno)));
 }
 
 } // namespace

@@ -86,9 +86,8 @@ std::optional<std::int64_t> StoreReader::idOf(const std::string& sql)
 Cursor StoreReader::newestNow()
 {
     Cursor cursor;
-    database_->forEachRow(database_->prepare("SELECT epoch, next_event - 1 FROM store"), [&](const SqliteStatement& row) {
-        cursor = {std::string(row.text(0)), row.integer(1)};
-    });
+    database_->forEachRow(database_->prepare("SELECT epoch, next_event - 1 FROM store"),
+                          [&](const SqliteStatement& row) { cursor = {std::string(row.text(0)), row.integer(1)}; });
     return cursor;
 }
 
@@ -182,9 +181,8 @@ void StoreReader::readApplications(Slice& slice)
     const auto statement = database_->prepare("SELECT application FROM sessions WHERE id = ?");
     for (const std::int64_t session : sessions) {
         statement.bind(1, session);
-        database_->forEachRow(statement, [&](const SqliteStatement& row) {
-            slice.applications.emplace(session, row.text(0));
-        });
+        database_->forEachRow(statement,
+                              [&](const SqliteStatement& row) { slice.applications.emplace(session, row.text(0)); });
     }
 }
 

@@ -144,16 +144,18 @@ public:
     {
         for (const auto& [key, value] : values)
             if (std::ranges::find(tables, key.view()) == tables.end())
-                readSetting({std::string(key.view())}, value, settings, ", and the tables [device], [events.\"NAME\"],"
-                                                                        " [stretches] and [sessions]");
+                readSetting({std::string(key.view())}, value, settings,
+                            ", and the tables [device], [events.\"NAME\"],"
+                            " [stretches] and [sessions]");
         forTable(values, "device", [&](const Way& way, const Value& value) { readSetting(way, value, labels); });
         forTable(values, "events", [&](const Way& way, const Value& value) { readEvents(way, value); });
         std::ranges::stable_sort(to_.configuration.allowed.events, {}, &EventRules::line);
         to_.configuration.allowed.stretches = readColumns(values, "stretches", stretchColumns);
         to_.configuration.allowed.sessions = readColumns(values, "sessions", sessionColumns);
-        if (to_.configuration.enabled && to_.configuration.servers.empty() && !values.contains("servers"))
-            problem({"enabled"}, "without servers nothing can leave: add servers = [\"tls://HOST:4222\"], or set "
-                                 "enabled = false");
+        if (to_.configuration.enabled && to_.configuration.servers.empty() && to_.problems.empty())
+            problem({"enabled"},
+                    "without servers nothing can leave: add servers = [\"tls://HOST:4222\"], or set "
+                    "enabled = false");
     }
 
 private:
@@ -176,8 +178,9 @@ private:
         const std::string& key = way.back();
         const auto setting = std::ranges::find(of, key, &Setting<UplinkConfiguration>::key);
         if (setting == of.end())
-            problem(way, fmt::format("unknown key {}: correct or remove it; the keys here are {}{}", key,
-                                     fmt::join(keysOf(of), ", "), others));
+            problem(way,
+                    fmt::format("unknown key {}: correct or remove it; the keys here are {}{}", key,
+                                fmt::join(keysOf(of), ", "), others));
         else if (!setting->read(value, to_.configuration))
             problem(way, fmt::format("{} = {} should be {}", key, value.text(), setting->expected));
     }
@@ -190,8 +193,8 @@ private:
             return;
         const auto table = value->dictionary();
         if (!table)
-            return problem({name}, fmt::format("{} = {} should be a table: begin it with a line [{}]", name,
-                                               value->text(), name));
+            return problem(
+                {name}, fmt::format("{} = {} should be a table: begin it with a line [{}]", name, value->text(), name));
         for (const auto& [key, inner] : *table)
             visit({name, std::string(key.view())}, inner);
     }
@@ -201,9 +204,10 @@ private:
         const std::string& names = way.back();
         const auto table = value.dictionary();
         if (!table)
-            return problem(way, fmt::format("the rules for events named {0} stand in a table of their own: "
-                                            "[events.\"{0}\"]",
-                                            names));
+            return problem(way,
+                           fmt::format("the rules for events named {0} stand in a table of their own: "
+                                       "[events.\"{0}\"]",
+                                       names));
         EventRules rules{.names = names, .line = lineOf(way)};
         for (const auto& [key, rule] : *table) {
             Way whole = way;
@@ -223,14 +227,16 @@ private:
         forTable(values, name, [&](const Way& way, const Value& value) {
             const auto column = std::ranges::find(columns, way.back(), &Column::name);
             if (column == columns.end())
-                return problem(way, fmt::format("unknown column {}: correct or remove it; the columns here are {}",
-                                                way.back(),
-                                                fmt::join(columns | std::views::transform(&Column::name), ", ")));
+                return problem(way,
+                               fmt::format("unknown column {}: correct or remove it; the columns here are {}",
+                                           way.back(),
+                                           fmt::join(columns | std::views::transform(&Column::name), ", ")));
             auto rule = readRule(way, value);
             if (rule && column->isNumber && rule->action == Rule::Action::Hash)
-                return problem(way, fmt::format("{} is a number, and a hash is not: use \"keep\", \"drop\" or a bucket "
-                                                "such as {{ bucket = [1, 10, 60] }}",
-                                                way.back()));
+                return problem(way,
+                               fmt::format("{} is a number, and a hash is not: use \"keep\", \"drop\" or a bucket "
+                                           "such as {{ bucket = [1, 10, 60] }}",
+                                           way.back()));
             if (rule)
                 rules.push_back(*std::move(rule));
         });
@@ -243,17 +249,19 @@ private:
         if (const auto table = value.dictionary()) {
             const Value* const edges = table->find("bucket");
             if (edges == nullptr || table->size() != 1)
-                problem(way, fmt::format("the table {0} is no rule: a rule is {1}. The name of an event stands in "
-                                         "quotes: [events.\"com.quarn.kesto.Playback.Stop\"]",
-                                         way.back(), whatRulesAre));
+                problem(way,
+                        fmt::format("the table {0} is no rule: a rule is {1}. The name of an event stands in "
+                                    "quotes: [events.\"com.quarn.kesto.Playback.Stop\"]",
+                                    way.back(), whatRulesAre));
             else if (auto read = edgesOf(*edges)) {
                 rule.action = Rule::Action::Bucket;
                 rule.edges = *std::move(read);
                 return rule;
             } else
-                problem(way, fmt::format("the edges {} of {} should be numbers, each larger than the one before it, "
-                                         "such as [1, 10, 60]",
-                                         edges->text(), way.back()));
+                problem(way,
+                        fmt::format("the edges {} of {} should be numbers, each larger than the one before it, "
+                                    "such as [1, 10, 60]",
+                                    edges->text(), way.back()));
             return std::nullopt;
         }
         constexpr std::pair<std::string_view, Rule::Action> actions[] = {

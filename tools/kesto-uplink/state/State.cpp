@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// One row, and the sessions that are open. The file has a rollback journal and no log: SQLite 3.40 can damage a database
-// with a log when two connections write, and here a second process may forget. What is overwritten is erased, so that no
-// earlier pseudonym is left in the file.
+// One row, and the sessions that are open. The file has a rollback journal and no log: SQLite 3.40 can damage a
+// database with a log when two connections write, and here a second process may forget. What is overwritten is erased,
+// so that no earlier pseudonym is left in the file.
 #include "kesto-uplink/state/State.h"
 
 #include "platform/linux/files/FileDescriptor.h"
@@ -74,13 +74,14 @@ void bindAll(const SqliteStatement& statement, int parameter, const First& first
 // Makes an empty file that only the directory's owner may read, also if it is root who makes it.
 void makeFile(const fs::path& file)
 {
-    const FileDescriptor made(::open(file.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, S_IRUSR | S_IWUSR));
+    const FileDescriptor made(
+        ::open(file.c_str(), O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, S_IRUSR | S_IWUSR));
     struct stat directory{};
     const bool isMade = made && ::stat(file.parent_path().c_str(), &directory) == 0
         && (directory.st_uid == ::geteuid() || ::fchown(made.get(), directory.st_uid, directory.st_gid) == 0);
     if (!isMade && errno != EEXIST)
-        throw StateError(fmt::format("the state {} cannot be made: {}", file.native(),
-                                     std::generic_category().message(errno)));
+        throw StateError(
+            fmt::format("the state {} cannot be made: {}", file.native(), std::generic_category().message(errno)));
 }
 
 } // namespace
@@ -234,9 +235,10 @@ bool State::underPseudonym(const Identity& as, const std::function<void()>& work
 Identity State::identity()
 {
     Identity identity;
-    forEachRow("SELECT pseudonym, pseudonym_born, hash_key, hash_key_born FROM uplink", [&](const SqliteStatement& row) {
-        identity = {std::string(row.text(0)), row.real(1), std::string(row.text(2)), row.real(3)};
-    });
+    forEachRow("SELECT pseudonym, pseudonym_born, hash_key, hash_key_born FROM uplink",
+               [&](const SqliteStatement& row) {
+                   identity = {std::string(row.text(0)), row.real(1), std::string(row.text(2)), row.real(3)};
+               });
     return identity;
 }
 
@@ -244,7 +246,7 @@ Cursor State::queued()
 {
     Cursor cursor;
     forEachRow("SELECT epoch, queued_id FROM uplink",
-        [&](const SqliteStatement& row) { cursor = {std::string(row.text(0)), row.integer(1)}; });
+               [&](const SqliteStatement& row) { cursor = {std::string(row.text(0)), row.integer(1)}; });
     return cursor;
 }
 
@@ -252,7 +254,7 @@ Cursor State::stored()
 {
     Cursor cursor;
     forEachRow("SELECT epoch, stored_id FROM uplink",
-        [&](const SqliteStatement& row) { cursor = {std::string(row.text(0)), row.integer(1)}; });
+               [&](const SqliteStatement& row) { cursor = {std::string(row.text(0)), row.integer(1)}; });
     return cursor;
 }
 
@@ -271,9 +273,10 @@ std::int64_t State::bytesSentOn(std::int64_t day)
 Totals State::totals()
 {
     Totals totals;
-    forEachRow("SELECT rows, batches, bytes, retries, not_allowed, lost_to_age FROM uplink", [&](const SqliteStatement& row) {
-        totals = {row.integer(0), row.integer(1), row.integer(2), row.integer(3), row.integer(4), row.integer(5)};
-    });
+    forEachRow(
+        "SELECT rows, batches, bytes, retries, not_allowed, lost_to_age FROM uplink", [&](const SqliteStatement& row) {
+            totals = {row.integer(0), row.integer(1), row.integer(2), row.integer(3), row.integer(4), row.integer(5)};
+        });
     return totals;
 }
 
@@ -281,7 +284,7 @@ std::optional<LastAnswer> State::lastAnswer()
 {
     std::optional<LastAnswer> answer;
     forEachRow("SELECT answer, answered FROM uplink WHERE answer IS NOT NULL",
-        [&](const SqliteStatement& row) { answer = {std::string(row.text(0)), row.real(1)}; });
+               [&](const SqliteStatement& row) { answer = {std::string(row.text(0)), row.real(1)}; });
     return answer;
 }
 
@@ -289,7 +292,7 @@ std::optional<double> State::onSince()
 {
     std::optional<double> since;
     forEachRow("SELECT on_since FROM uplink WHERE on_since IS NOT NULL",
-        [&](const SqliteStatement& row) { since = row.real(0); });
+               [&](const SqliteStatement& row) { since = row.real(0); });
     return since;
 }
 
@@ -301,8 +304,7 @@ bool State::noteQueued(const Identity& as, const Progress& progress, std::int64_
     return underPseudonym(as, [&] {
         const Cursor& last = progress.last;
         if (queued().epoch != last.epoch)
-            run("UPDATE uplink SET epoch = ?, queued_id = 0, stored_id = 0, sent_id = 0",
-                last.epoch);
+            run("UPDATE uplink SET epoch = ?, queued_id = 0, stored_id = 0, sent_id = 0", last.epoch);
         const bool wasAllStored = queued() == stored();
         run("UPDATE uplink SET queued_id = ?, rows = rows + ?, bytes = bytes + ?, not_allowed = not_allowed + ?,"
             " lost_to_age = lost_to_age + ?",
@@ -320,8 +322,8 @@ bool State::noteQueued(const Identity& as, const Progress& progress, std::int64_
 bool State::noteStored(const Identity& as, const Cursor& upTo)
 {
     return underPseudonym(as, [&] {
-        run("UPDATE uplink SET stored_id = iif(?1 >= sent_id, queued_id, max(?1, stored_id)) WHERE epoch = ?2",
-            upTo.id, upTo.epoch);
+        run("UPDATE uplink SET stored_id = iif(?1 >= sent_id, queued_id, max(?1, stored_id)) WHERE epoch = ?2", upTo.id,
+            upTo.epoch);
     });
 }
 
@@ -409,8 +411,7 @@ void State::forget(const Cursor& newest, double now)
     inTransaction([&] {
         setIdentity(newIdentity(now));
         setOpenSessions({});
-        run("UPDATE uplink SET epoch = ?1, queued_id = ?2, stored_id = ?2, sent_id = 0",
-            newest.epoch, newest.id);
+        run("UPDATE uplink SET epoch = ?1, queued_id = ?2, stored_id = ?2, sent_id = 0", newest.epoch, newest.id);
     });
 }
 

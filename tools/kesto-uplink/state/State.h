@@ -1,9 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // The room of state: what the uplink remembers of the device and of what it has sent, in uplink.sqlite3.
 //
-// Everything is written in transactions, so that a kill at any moment leaves a state that was true. A second process may
-// read and forget beside the one that sends: whoever sends names the pseudonym under which it did, and what came of it
-// counts only as long as that is still the pseudonym.
+// Everything is written in transactions, so that a kill at any moment leaves a state that was true. A second process
+// may read and forget beside the one that sends: whoever sends names the pseudonym under which it did, and what came of
+// it counts only as long as that is still the pseudonym.
 //
 // There are two places in the store. `queued` is behind the last row that needs no more sending: the stream has
 // answered, or the row may not leave. `stored` is behind the last row that the fleet's database is known to have. Both
