@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// `kesto-uplink run`: the service. The rounds have a thread of their own, so that a signal ends the program also while a
-// round waits for servers. What is not noted then is sent again; so the program need not wait for its end.
+// `kesto-uplink run`: the service. The rounds have a thread of their own, so that a signal ends the program also while
+// a round waits for servers. What is not noted then is sent again; so the program need not wait for its end.
 #include "kesto-uplink/Commands.h"
 #include "kesto-uplink/outbox/Outbox.h"
 #include "kesto-uplink/rounds/Metered.h"
@@ -60,8 +60,8 @@ class OutboxSource : public Source {
 public:
     OutboxSource(const Places& places, const UplinkConfiguration& configuration, const Identity& identity)
         : outbox_(places.database, configuration, identity,
-                  {.compressedBytes = std::min<std::size_t>(OutboxLimits().compressedBytes,
-                                                            configuration.maximumBytesADay)})
+                  {.compressedBytes =
+                       std::min<std::size_t>(OutboxLimits().compressedBytes, configuration.maximumBytesADay)})
     {
     }
 
@@ -90,7 +90,9 @@ std::optional<std::string> reasonToBeOff(const Places& places, const CheckedUpli
 class Service {
 public:
     explicit Service(const Places& places)
-        : places_(places), state_(State::open(places.state, wallClock())), patience_(places.state / "waiting-since"),
+        : places_(places),
+          state_(State::open(places.state, wallClock())),
+          patience_(places.state / "waiting-since"),
           sleep_(places.database)
     {
     }
@@ -135,25 +137,26 @@ private:
         }
         state_.noteOn(wallClock());
         schedule_.setInterval(configuration.intervalSeconds);
-        const auto transport = std::make_shared<JetStream>(
-            Servers{.urls = configuration.servers, .authorities = configuration.ca},
-            readCredentials(configuration.credentials));
+        const auto transport =
+            std::make_shared<JetStream>(Servers{.urls = configuration.servers, .authorities = configuration.ca},
+                                        readCredentials(configuration.credentials));
         {
             const std::scoped_lock lock(mutex_);
             if (isEnding_)
                 return {Outcome::Interrupted};
             transport_ = transport;
         }
-        return Round({.forgetWhen = configuration.forgetWhen,
-                      .maximumBytesADay = configuration.maximumBytesADay,
-                      .pseudonymDays = configuration.pseudonymDays,
-                      .hashKeyDays = configuration.hashKeyDays},
-                     state_, patience_, *transport,
-                     [&](const Identity& identity) {
-                         return std::make_unique<OutboxSource>(places_, configuration, identity);
-                     },
-                     [this] { return Today{wallClock(), days_.day(wallClock(), uptime())}; },
-                     [&] { return !configuration.metered && isMetered(); })
+        return Round(
+                   {.forgetWhen = configuration.forgetWhen,
+                    .maximumBytesADay = configuration.maximumBytesADay,
+                    .pseudonymDays = configuration.pseudonymDays,
+                    .hashKeyDays = configuration.hashKeyDays},
+                   state_, patience_, *transport,
+                   [&](const Identity& identity) {
+                       return std::make_unique<OutboxSource>(places_, configuration, identity);
+                   },
+                   [this] { return Today{wallClock(), days_.day(wallClock(), uptime())}; },
+                   [&] { return !configuration.metered && isMetered(); })
             .run();
     }
 

@@ -22,9 +22,9 @@ Metered networkIsMetered()
     sd_bus_message* asked = nullptr;
     sd_bus_message* answered = nullptr;
     unsigned value = unknown;
-    int status = sd_bus_message_new_method_call(bus.get(), &asked, "org.freedesktop.NetworkManager",
-                                                "/org/freedesktop/NetworkManager", "org.freedesktop.DBus.Properties",
-                                                "Get");
+    int status =
+        sd_bus_message_new_method_call(bus.get(), &asked, "org.freedesktop.NetworkManager",
+                                       "/org/freedesktop/NetworkManager", "org.freedesktop.DBus.Properties", "Get");
     if (status >= 0)
         status = sd_bus_message_set_auto_start(asked, 0); // a question starts no service
     if (status >= 0)

@@ -19,8 +19,8 @@ public:
 
     explicit Patience(std::filesystem::path file) : file_(std::move(file)) { }
 
-    // More than `stored` is sent. Goes on waiting if it was so before, with the same `stored`, and the clock was not set
-    // back since; else the wait begins now.
+    // More than `stored` is sent. Goes on waiting if it was so before, with the same `stored`, and the clock was not
+    // set back since; else the wait begins now.
     void wait(const Cursor& stored, double now);
     // Whether that has been so for longer than the limit.
     [[nodiscard]] bool isOver(const Cursor& stored, double now) const;

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// A batch is sent before its place is noted, and noted before the next is read: the order of these steps is what makes a
-// kill harmless.
+// A batch is sent before its place is noted, and noted before the next is read: the order of these steps is what makes
+// a kill harmless.
 #include "kesto-uplink/rounds/Round.h"
 
 #include <fmt/format.h>
@@ -28,8 +28,13 @@ Outcome outcomeOf(Answer::Kind kind)
 Round::Round(const Terms& terms, State& state, Patience& patience, Transport& transport,
              std::function<std::unique_ptr<Source>(const Identity&)> sourceFor, std::function<Today()> clock,
              std::function<bool()> isMetered)
-    : terms_(terms), state_(state), patience_(patience), transport_(transport), sourceFor_(std::move(sourceFor)),
-      clock_(std::move(clock)), isMetered_(std::move(isMetered))
+    : terms_(terms),
+      state_(state),
+      patience_(patience),
+      transport_(transport),
+      sourceFor_(std::move(sourceFor)),
+      clock_(std::move(clock)),
+      isMetered_(std::move(isMetered))
 {
 }
 
@@ -37,8 +42,8 @@ RoundResult Round::run()
 {
     isForgotten_ = false;
     complaint_.clear();
-    const bool isPseudonymDue
-        = state_.renew(terms_.pseudonymDays, terms_.hashKeyDays, clock_().now) == Renewal::Waiting;
+    const bool isPseudonymDue =
+        state_.renew(terms_.pseudonymDays, terms_.hashKeyDays, clock_().now) == Renewal::Waiting;
     identity_ = state_.identity();
     source_ = sourceFor_(identity_);
     auto batch = nextToSend();

@@ -2,9 +2,9 @@
 // The room of rounds: when the uplink sends, how much, and what it does with the answers.
 //
 // One round sends all that waits, until nothing is left, the day's bytes are used up, or an answer says no. It connects
-// only if something is to be sent or told. At "stored by the stream" the place `queued` moves, at the fleet's confirmation
-// the place `stored`. A kill at any moment lets the next round begin at a place that was true: at worst a batch is sent
-// once more, and its rows have the same keys.
+// only if something is to be sent or told. At "stored by the stream" the place `queued` moves, at the fleet's
+// confirmation the place `stored`. A kill at any moment lets the next round begin at a place that was true: at worst a
+// batch is sent once more, and its rows have the same keys.
 //
 // What the stream has is not sent again, unless the fleet has not confirmed it for a day: then the stream has lost it.
 #pragma once
@@ -48,7 +48,8 @@ struct RoundResult {
 class Source {
 public:
     virtual ~Source() = default;
-    [[nodiscard]] virtual std::optional<Batch> next(const Cursor& after, const std::set<std::int64_t>& openSessions) = 0;
+    [[nodiscard]] virtual std::optional<Batch> next(const Cursor& after,
+                                                    const std::set<std::int64_t>& openSessions) = 0;
 };
 
 // What a round may do.

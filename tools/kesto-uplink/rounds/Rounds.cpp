@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The order of one turn: sleep, look for news, send. Looking comes before sending, so nothing that is stored meanwhile is
-// overlooked.
+// The order of one turn: sleep, look for news, send. Looking comes before sending, so nothing that is stored meanwhile
+// is overlooked.
 #include "kesto-uplink/rounds/Rounds.h"
 
 namespace kesto_uplink {
@@ -25,8 +25,8 @@ void runRounds(const std::function<RoundResult()>& round, Schedule& schedule, Sl
 // The servers of a list are away in turn, and the bytes of a day are others each day: there only the kind matters.
 std::optional<std::string> Diary::line(const RoundResult& result)
 {
-    const bool isLasting = result.outcome == Outcome::Away || result.outcome == Outcome::Full
-        || result.outcome == Outcome::DayUsedUp;
+    const bool isLasting =
+        result.outcome == Outcome::Away || result.outcome == Outcome::Full || result.outcome == Outcome::DayUsedUp;
     const bool isNew = result.outcome != lastOutcome_ || (!isLasting && result.sentence != last_);
     if (result.outcome == Outcome::Nothing || !isNew)
         return std::nullopt;

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The life of the service: rounds, and the sleep between them. An idle device is not woken: the uplink then sleeps until
-// the store's files change.
+// The life of the service: rounds, and the sleep between them. An idle device is not woken: the uplink then sleeps
+// until the store's files change.
 #pragma once
 
 #include "kesto-uplink/rounds/Round.h"

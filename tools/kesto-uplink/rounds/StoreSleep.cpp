@@ -14,7 +14,8 @@
 namespace kesto_uplink {
 
 StoreSleep::StoreSleep(std::filesystem::path database)
-    : database_(std::move(database)), ended_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK))
+    : database_(std::move(database)),
+      ended_(::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK))
 {
     watch();
 }

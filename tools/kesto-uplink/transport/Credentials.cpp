@@ -69,8 +69,8 @@ Credentials readCredentials(const std::filesystem::path& file)
                 fail(file, "has a plain that is not true or false");
             credentials.isPlain = value.asBoolean();
         } else if (text == texts.end())
-            fail(file, fmt::format("has the unknown key {}: it takes name, password or key and seed, and plain",
-                                   key.view()));
+            fail(file,
+                 fmt::format("has the unknown key {}: it takes name, password or key and seed, and plain", key.view()));
         else if (value.stringView().empty())
             fail(file, fmt::format("has a {} that is not text", key.view()));
         else

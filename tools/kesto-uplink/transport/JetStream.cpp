@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Statuses and codes of the library become the few kinds of answers here. A publish that the servers do not permit looks
-// like one that nobody answers; only the last error of the connection tells the two apart.
+// Statuses and codes of the library become the few kinds of answers here. A publish that the servers do not permit
+// looks like one that nobody answers; only the last error of the connection tells the two apart.
 #include "kesto-uplink/transport/JetStream.h"
 
 #include "kesto-uplink/transport/ConfirmationText.h"
@@ -64,7 +64,9 @@ std::string wrongEntry(const std::string& url, bool isPlain)
     if (!url.starts_with("nats://"))
         return fmt::format("the server {} must begin with tls://, or nats:// without encryption", url);
     if (!isPlain)
-        return fmt::format("the server {} is without encryption: write tls://, or allow it by plain = true in the credentials file", url);
+        return fmt::format(
+            "the server {} is without encryption: write tls://, or allow it by plain = true in the credentials file",
+            url);
     return {};
 }
 
@@ -85,7 +87,9 @@ bool isForGood(jsErrCode code)
 } // namespace
 
 JetStream::JetStream(Servers servers, Credentials credentials, TimeLimits limits)
-    : servers_(std::move(servers)), credentials_(std::move(credentials)), limits_(limits),
+    : servers_(std::move(servers)),
+      credentials_(std::move(credentials)),
+      limits_(limits),
       eventSubject_("kesto.events." + credentials_.name)
 {
     std::ranges::shuffle(servers_.urls, std::mt19937(std::random_device()()));
@@ -145,8 +149,7 @@ Answer JetStream::connectTo(const std::string& url)
     const natsStatus status = natsConnection_Connect(&made, options.get());
     Connection connection(made);
     switch (status) {
-    case NATS_OK:
-        break;
+    case NATS_OK: break;
     case NATS_CONNECTION_AUTH_FAILED:
     case NATS_NOT_PERMITTED:
         return refused(fmt::format("{} does not accept {} with this {}: check the credentials file and the accounts of "
@@ -160,8 +163,7 @@ Answer JetStream::connectTo(const std::string& url)
         return refused(fmt::format("{} has no encryption: enable TLS at the server", url));
     case NATS_SECURE_CONNECTION_REQUIRED:
         return refused(fmt::format("{} takes encrypted connections only: write tls:// in servers", url));
-    default:
-        return away(fmt::format("{} is not reached: {}", url, lastError(status)));
+    default: return away(fmt::format("{} is not reached: {}", url, lastError(status)));
     }
     jsOptions contextOptions;
     jsOptions_Init(&contextOptions);
@@ -224,8 +226,8 @@ Answer JetStream::failure(natsStatus status, jsErrCode code)
         return refused(fmt::format("{} refuses {}: {}; check the permissions of this name at the servers", server_,
                                    credentials_.name, complaint));
     if (status == NATS_NO_RESPONDERS) // the library then gives a code, too
-        return away(fmt::format("no stream at {} takes {}: it is missing, or has no leader for now", server_,
-                                eventSubject_));
+        return away(
+            fmt::format("no stream at {} takes {}: it is missing, or has no leader for now", server_, eventSubject_));
     if (isFull(code))
         return {Answer::Kind::Full, false,
                 fmt::format("the stream is full: {}; the device keeps its events and tries again", lastError(status))};
@@ -242,16 +244,16 @@ Answer JetStream::put(const std::string& id, std::string_view batch)
     if (!connection_)
         return away("there is no connection");
     natsMsg* made = nullptr;
-    natsStatus status
-        = natsMsg_Create(&made, eventSubject_.c_str(), nullptr, batch.data(), static_cast<int>(batch.size()));
+    natsStatus status =
+        natsMsg_Create(&made, eventSubject_.c_str(), nullptr, batch.data(), static_cast<int>(batch.size()));
     const Message message(made);
     if (status == NATS_OK)
         status = natsMsgHeader_Set(message.get(), "Kesto-Edition", edition);
     jsPubOptions options;
     jsPubOptions_Init(&options);
     options.MsgId = id.c_str();
-    options.MaxWait = limits_.answer.count()
-        + static_cast<std::int64_t>(batch.size()) * 1000 / limits_.slowestBytesPerSecond;
+    options.MaxWait =
+        limits_.answer.count() + static_cast<std::int64_t>(batch.size()) * 1000 / limits_.slowestBytesPerSecond;
     jsPubAck* received = nullptr;
     jsErrCode code = {};
     if (status == NATS_OK)

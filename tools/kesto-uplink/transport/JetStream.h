@@ -1,9 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // The transport to the streams of NATS (JetStream), by libnats.
 //
-// Each server of the list is asked in turn, beginning anywhere, so that many devices spread over the servers. The library
-// itself never connects again: a round that loses its connection decides itself what to do. Every publish waits for its
-// answer, since the library has no time limit for others.
+// Each server of the list is asked in turn, beginning anywhere, so that many devices spread over the servers. The
+// library itself never connects again: a round that loses its connection decides itself what to do. Every publish waits
+// for its answer, since the library has no time limit for others.
 #pragma once
 
 #include "kesto-uplink/transport/Credentials.h"

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // When rounds come, what the log says of them, and to which day bytes count; without a clock.
-#include "kesto-uplink/rounds/Rounds.h"
 #include "kesto-uplink/rounds/Schedule.h"
+#include "kesto-uplink/rounds/Rounds.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -142,8 +142,9 @@ TEST(Rounds, anIdleDeviceSleepsUntilThereIsNews)
             return result;
         },
         schedule, sleep, [&](const RoundResult& result) { reported.push_back(result.outcome); });
-    EXPECT_THAT(sleep.said, ElementsAre("sleep 0", "round", "sleep 900", "news", "round", "sleep 900", "news", "round",
-                                        "sleep 900", "round", "sleep 900"));
+    EXPECT_THAT(sleep.said,
+                ElementsAre("sleep 0", "round", "sleep 900", "news", "round", "sleep 900", "news", "round", "sleep 900",
+                            "round", "sleep 900"));
     EXPECT_THAT(reported, ElementsAre(Outcome::Sent, Outcome::Nothing, Outcome::Away, Outcome::Sent));
 }
 

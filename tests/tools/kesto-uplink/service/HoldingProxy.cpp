@@ -30,7 +30,8 @@ sockaddr_in loopback(int port)
 } // namespace
 
 HoldingProxy::HoldingProxy(int serverPort)
-    : serverPort_(serverPort), listener_(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0))
+    : serverPort_(serverPort),
+      listener_(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0))
 {
     sockaddr_in address = loopback(0);
     socklen_t size = sizeof address;

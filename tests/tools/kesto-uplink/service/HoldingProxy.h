@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// A way to a server that can hold back the server's answer to a batch: the stream then has the batch, and the device does
-// not know it.
+// A way to a server that can hold back the server's answer to a batch: the stream then has the batch, and the device
+// does not know it.
 #pragma once
 
 #include <atomic>

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The whole path of the device, through real programs: what clients report to kestod is in the stream, once, whatever is
-// killed in between.
+// The whole path of the device, through real programs: what clients report to kestod is in the stream, once, whatever
+// is killed in between.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 #include "kesto-uplink/state/State.h"
@@ -159,8 +159,8 @@ TEST_F(UplinkService, WhatIsAllowedIsInTheStreamOnceWhateverIsKilled)
     EXPECT_EQ(uplink.exitStatus(), 0);
 }
 
-// New events come between the kills, so a batch may have more rows when it is sent again: then it is another message, and
-// receivers know its rows by their keys.
+// New events come between the kills, so a batch may have more rows when it is sent again: then it is another message,
+// and receivers know its rows by their keys.
 TEST_F(UplinkService, KillsAtRandomLoseNothing)
 {
     proxy.holdNoMore();

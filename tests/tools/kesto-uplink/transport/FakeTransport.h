@@ -77,7 +77,8 @@ public:
             connected_ = false;
             return away("the connection is lost");
         }
-        const bool isKnown = std::ranges::any_of(stream_.messages, [&](const auto& message) { return message.first == id; });
+        const bool isKnown =
+            std::ranges::any_of(stream_.messages, [&](const auto& message) { return message.first == id; });
         if (!isKnown)
             stream_.messages.emplace_back(id, batch);
         if (stream_.afterStoring)

@@ -160,8 +160,8 @@ void NatsServer::fill()
 {
     asAdministrator([](natsConnection*, jsCtx* context) {
         const std::string block(512 << 10, 'x');
-        while (js_Publish(nullptr, context, "kesto.events.filler", block.data(), static_cast<int>(block.size()), nullptr,
-                          nullptr)
+        while (js_Publish(nullptr, context, "kesto.events.filler", block.data(), static_cast<int>(block.size()),
+                          nullptr, nullptr)
                == NATS_OK) { }
     });
 }

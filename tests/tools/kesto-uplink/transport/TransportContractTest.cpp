@@ -85,7 +85,8 @@ public:
     void drain() override { server_.drain(); }
     void confirm(const std::string& device, const std::string& epoch, int id) override
     {
-        server_.publish("kesto.stored.alpha." + device, R"({"epoch":")" + epoch + R"(","id":)" + std::to_string(id) + "}");
+        server_.publish("kesto.stored.alpha." + device,
+                        R"({"epoch":")" + epoch + R"(","id":)" + std::to_string(id) + "}");
     }
     std::vector<std::pair<std::string, std::string>> stored() override
     {
@@ -106,7 +107,10 @@ protected:
 };
 
 struct Names {
-    template <typename Side> static std::string GetName(int) { return std::is_same_v<Side, FakeFleet> ? "Fake" : "Nats"; }
+    template <typename Side> static std::string GetName(int)
+    {
+        return std::is_same_v<Side, FakeFleet> ? "Fake" : "Nats";
+    }
 };
 using Fleets = testing::Types<FakeFleet, NatsFleet>;
 TYPED_TEST_SUITE(TransportContract, Fleets, Names);
