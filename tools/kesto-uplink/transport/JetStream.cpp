@@ -18,6 +18,7 @@ namespace {
 
 constexpr const char* edition = "1"; // of the rows in a batch
 constexpr const char* confirmationStream = "KESTO_STORED";
+constexpr std::size_t largestBatch = std::size_t{512} * 1024;
 
 Answer refused(std::string sentence)
 {
@@ -100,6 +101,12 @@ JetStream::~JetStream()
     disconnect();
 }
 
+// In milliseconds.
+std::int64_t JetStream::timeFor(std::size_t bytes) const
+{
+    return limits_.answer.count() + static_cast<std::int64_t>(bytes) * 1000 / limits_.slowestBytesPerSecond;
+}
+
 natsStatus JetStream::sign(char** /*problem*/, unsigned char** signature, int* size, const char* nonce, void* transport)
 {
     return nats_Sign(static_cast<JetStream*>(transport)->credentials_.seed.c_str(), nonce, signature, size);
@@ -118,9 +125,11 @@ JetStream::Options JetStream::optionsFor(const std::string& url)
     set(natsOptions_SetURL, url.c_str());
     set(natsOptions_SetName, "kesto-uplink");
     set(natsOptions_SetTimeout, limit);
-    set(natsOptions_SetWriteDeadline, limit);
+    set(natsOptions_SetWriteDeadline, timeFor(largestBatch));
     set(natsOptions_SetAllowReconnect, false);
     set(natsOptions_SetFailRequestsOnDisconnect, true);
+    // Else the library prints errors, which the answers tell.
+    set(natsOptions_SetErrorHandler, [](natsConnection*, natsSubscription*, natsStatus, void*) { }, nullptr);
     // Servers let a device listen only to its own answers.
     set(natsOptions_SetCustomInboxPrefix, ("_INBOX_" + credentials_.name).c_str());
     if (credentials_.seed.empty())
@@ -252,8 +261,7 @@ Answer JetStream::put(const std::string& id, std::string_view batch)
     jsPubOptions options;
     jsPubOptions_Init(&options);
     options.MsgId = id.c_str();
-    options.MaxWait =
-        limits_.answer.count() + static_cast<std::int64_t>(batch.size()) * 1000 / limits_.slowestBytesPerSecond;
+    options.MaxWait = timeFor(batch.size());
     jsPubAck* received = nullptr;
     jsErrCode code = {};
     if (status == NATS_OK)

@@ -59,6 +59,7 @@ private:
     [[nodiscard]] Answer failure(natsStatus status, jsErrCode code);
     [[nodiscard]] Answer confirmationsFailed(natsStatus status);
     [[nodiscard]] bool isInterrupted();
+    [[nodiscard]] std::int64_t timeFor(std::size_t bytes) const;
     static natsStatus sign(char** problem, unsigned char** signature, int* size, const char* nonce, void* transport);
 
     Servers servers_;
