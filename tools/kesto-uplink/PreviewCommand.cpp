@@ -8,6 +8,7 @@
 #include "kesto-uplink/outbox/Outbox.h"
 #include "kesto/ExitStatus.h"
 #include "kesto/Terminal.h"
+#include "kesto/report/ReportWords.h"
 #include "kesto/results/MomentText.h"
 
 #include <CLI/Error.hpp>
@@ -103,7 +104,7 @@ private:
 
     void printLines()
     {
-        EventDatabase(options_.places.database); // throws if there is none
+        const EventDatabase isThere(options_.places.database); // throws if not
         Outbox outbox(options_.places.database, checked_.configuration, identity_);
         if (!options_.since.empty()) {
             after_ = outbox.before(*parseMoment(options_.since));
@@ -128,18 +129,22 @@ private:
                        options_.places.configuration.native());
         if (!hint_.empty())
             fmt::print(stderr, "{}.\n", hint_);
-        fmt::print(stderr, "{} rows in {} batches would leave, compressed to {}.\n", sum_.rows, sum_.batches,
+        fmt::print(stderr, "{} would leave (batches: {}; compressed: {}).\n", rowsText(sum_.rows), sum_.batches,
                    sizeText(static_cast<std::uint64_t>(sum_.bytes)));
         explain(sum_.leftOut.notAllowed, "stay, because no rule allows them");
         explain(sum_.leftOut.unreadable,
                 "cannot leave, because their payload is no JSON object, or has a number that JSON has not");
         explain(sum_.leftOut.tooLarge, "cannot leave, because each alone is larger than a batch may be");
         if (sum_.leftOut.lostToAge > 0)
-            fmt::print(stderr, "{} rows are lost: the event store removed them before they could leave.\n",
-                       sum_.leftOut.lostToAge);
+            fmt::print(stderr,
+                       "Lost to age: {}. The event store removed what was too old or too much before it could "
+                       "leave.\n",
+                       rowsText(sum_.leftOut.lostToAge));
         for (const std::string& sentence : suspects_)
             fmt::print(stderr, "{}\n", sentence);
     }
+
+    static std::string rowsText(std::int64_t count) { return countText(static_cast<std::size_t>(count), "row"); }
 
     static void explain(const Counts& counts, std::string_view why)
     {

@@ -8,6 +8,7 @@
 #include "kesto/ExitStatus.h"
 #include "kesto/JsonValues.h"
 #include "kesto/Terminal.h"
+#include "kesto/report/ReportWords.h"
 
 #include <cmath>
 #include <cstdio>
@@ -92,7 +93,7 @@ private:
         if (!problems_.empty())
             return;
         try {
-            EventDatabase(options_.places.database); // throws if there is none
+            const EventDatabase isThere(options_.places.database); // throws if not
             const Remembered known = remembered_.value_or(Remembered{.identity = newIdentity(present())});
             Outbox outbox(options_.places.database, checked_.configuration, known.identity);
             Waiting waiting;
@@ -139,18 +140,18 @@ private:
             const bool isAllStored = remembered_->queued == remembered_->stored;
             text += fmt::format("pseudonym    {} since {}\n", remembered_->identity.pseudonym,
                                 momentText(remembered_->identity.pseudonymBorn));
-            text += fmt::format("sent         {} rows in {} batches, {}; {} today; {} retries\n", totals.rows,
-                                totals.batches, size(totals.bytes), size(remembered_->bytesToday), totals.retries);
+            text += fmt::format("sent         {}, {} ({} today); batches: {}, retries: {}\n", rowsText(totals.rows),
+                                size(totals.bytes), size(remembered_->bytesToday), totals.batches, totals.retries);
             text += fmt::format("stored       {}\n",
                                 isAllStored ? "all that was sent"
                                             : fmt::format("up to ID {}; sent up to ID {}", remembered_->stored.id,
                                                           remembered_->queued.id));
-            text += fmt::format("left out     {} rows that may not leave; {} lost to age\n", totals.notAllowed,
+            text += fmt::format("left out     {} may not leave; lost to age: {}\n", rowsText(totals.notAllowed),
                                 totals.lostToAge);
         }
         if (waiting_)
-            text += fmt::format("waiting      {}{} rows, {}{}\n", waiting_->areMore ? "at least " : "", waiting_->rows,
-                                size(waiting_->bytes),
+            text += fmt::format("waiting      {}{}, {}{}\n", waiting_->areMore ? "at least " : "",
+                                rowsText(waiting_->rows), size(waiting_->bytes),
                                 waiting_->oldest ? "; the oldest since " + momentText(*waiting_->oldest) : "");
         if (remembered_)
             text +=
@@ -164,6 +165,7 @@ private:
         return text;
     }
 
+    static std::string rowsText(std::int64_t count) { return countText(static_cast<std::size_t>(count), "row"); }
     static std::string size(std::int64_t bytes) { return sizeText(static_cast<std::uint64_t>(bytes)); }
 
     // --- For programs

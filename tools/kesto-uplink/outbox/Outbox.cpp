@@ -37,6 +37,7 @@ std::int64_t LeftOut::rows() const
 Progress Batch::progress() const
 {
     return {.last = last,
+            .first = first.id,
             .rows = rows,
             .bytes = std::ssize(bytes),
             .notAllowed = leftOut.rows(),

@@ -63,8 +63,8 @@ public:
     Outbox(std::filesystem::path database, const UplinkConfiguration& configuration, const Identity& identity,
            const OutboxLimits& limits = {});
 
-    // What comes behind the cursor, with the sessions that are open there; nothing if there is nothing. If the cursor
-    // is of another database, the batch begins with the oldest row of this one. `sent` is the clock of the device.
+    // What comes behind the cursor, with the sessions that are open there; nothing if there is nothing. A cursor of
+    // another database is as for StoreReader. `sent` is the clock of the device.
     [[nodiscard]] std::optional<Batch> next(const Cursor& after, const std::set<std::int64_t>& openSessions,
                                             double sent);
 

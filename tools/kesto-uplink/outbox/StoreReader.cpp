@@ -6,6 +6,7 @@
 #include <fmt/format.h>
 #include <iterator>
 #include <set>
+#include <string_view>
 #include <system_error>
 #include <utility>
 
@@ -98,6 +99,19 @@ std::optional<std::int64_t> StoreReader::oldestID()
     return event && stretch ? std::min(event, stretch) : event ? event : stretch;
 }
 
+// The cursor's ID in this database. One that was made to save the rows of a damaged one has these under the same IDs,
+// so the reader goes on where it was. 0: the cursor says nothing here.
+std::int64_t StoreReader::placeHere(const Cursor& after, const std::string& epoch)
+{
+    if (after.epoch == epoch)
+        return after.id;
+    if (idOf("SELECT 1 FROM sqlite_schema WHERE type = 'table' AND name = 'earlier_store'") != 1)
+        return 0;
+    const auto statement = database_->prepare("SELECT next_event - 1 FROM earlier_store WHERE epoch = ?");
+    statement.bind(1, std::string_view(after.epoch));
+    return database_->step(statement) ? std::min(after.id, statement.integer(0)) : 0;
+}
+
 // --- Slices
 
 std::optional<Slice> StoreReader::read(const Cursor& after, const Limits& limits)
@@ -108,8 +122,8 @@ std::optional<Slice> StoreReader::read(const Cursor& after, const Limits& limits
         if (!oldest)
             return;
         const Cursor newest = newestNow();
-        const bool isBegun = after.epoch == newest.epoch && after.id > 0;
-        Slice slice{.after = {newest.epoch, isBegun ? after.id : *oldest - 1}, .last = newest.id};
+        const std::int64_t before = placeHere(after, newest.epoch);
+        Slice slice{.after = {newest.epoch, before > 0 ? before : *oldest - 1}, .last = newest.id};
         if (slice.last <= slice.after.id)
             return;
         readEvents(slice, limits);

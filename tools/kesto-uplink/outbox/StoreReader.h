@@ -68,8 +68,9 @@ public:
         std::int64_t rows = 2048;
         std::int64_t payloadBytes = 1024 * 1024; // but at least one event
     };
-    // What comes behind the cursor. If it is of another database, the slice begins with the oldest row of this one.
-    // Nothing if nothing is there, or if the service is about to put saved rows there.
+    // What comes behind the cursor. If it is of another database, the slice begins with the oldest row of this one; but
+    // if this one was made to save the rows of that one, the slice goes on behind the cursor's ID. Nothing if nothing
+    // is there, or if the service is about to put saved rows there.
     [[nodiscard]] std::optional<Slice> read(const Cursor& after, const Limits& limits);
     // Those of them that the store still knows, by ID; none if the store is another by now.
     [[nodiscard]] std::vector<StoredSession> sessions(const std::set<std::int64_t>& wanted, const std::string& epoch);
@@ -87,6 +88,7 @@ private:
     [[nodiscard]] Cursor newestNow();
     [[nodiscard]] std::optional<std::int64_t> oldestID();
     [[nodiscard]] std::optional<std::int64_t> idOf(const std::string& sql);
+    [[nodiscard]] std::int64_t placeHere(const Cursor& after, const std::string& epoch);
     void readEvents(Slice& slice, const Limits& limits);
     void readStretches(Slice& slice, const Limits& limits);
     void readApplications(Slice& slice);

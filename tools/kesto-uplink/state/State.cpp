@@ -304,7 +304,8 @@ bool State::noteQueued(const Identity& as, const Progress& progress, std::int64_
     return underPseudonym(as, [&] {
         const Cursor& last = progress.last;
         if (queued().epoch != last.epoch)
-            run("UPDATE uplink SET epoch = ?, queued_id = 0, stored_id = 0, sent_id = 0", last.epoch);
+            run("UPDATE uplink SET epoch = ?1, queued_id = ?2, stored_id = ?2, sent_id = 0", last.epoch,
+                progress.first - 1);
         const bool wasAllStored = queued() == stored();
         run("UPDATE uplink SET queued_id = ?, rows = rows + ?, bytes = bytes + ?, not_allowed = not_allowed + ?,"
             " lost_to_age = lost_to_age + ?",

@@ -62,6 +62,7 @@ struct LastAnswer {
 // What came of a range of the store.
 struct Progress {
     Cursor last = {};
+    std::int64_t first = 1; // the first ID of the range
     std::int64_t rows = 0; // that were sent; 0: there was nothing to send
     std::int64_t bytes = 0; // that were sent
     std::int64_t notAllowed = 0;

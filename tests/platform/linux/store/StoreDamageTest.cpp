@@ -548,6 +548,21 @@ TEST_F(StoreDamageTest, SavedEventsKeepTheirNumbersAndTimesAndNewOnesGetHigherNu
     EXPECT_EQ(reader.text("SELECT id || ' ' || time FROM events WHERE name = 'com.quarn.after'"), "1001 1800000100.0");
 }
 
+// So a reader knows which rows it has read before.
+TEST_F(StoreDamageTest, TheNewDatabaseNamesTheEpochOfTheDamagedOneAndTheNumberFromWhichOnItsRowsAreNew)
+{
+    keepAndClose(1000);
+    const std::string epoch = StoreReader(file).texts("SELECT epoch FROM store").at(0);
+    const std::int64_t next = StoreReader(file).number("SELECT next_event FROM store");
+    support::overwrite(file, 0, std::string(pageSize, 'x'));
+    keep(1, "com.quarn.after");
+    settle();
+    EXPECT_EQ(StoreReader(file).texts("SELECT epoch FROM earlier_store").at(0), epoch);
+    EXPECT_EQ(StoreReader(file).number("SELECT next_event FROM earlier_store"), next);
+    EXPECT_NE(StoreReader(file).texts("SELECT epoch FROM store").at(0), epoch);
+    EXPECT_GE(StoreReader(file).number("SELECT max(id) FROM events WHERE name = 'com.quarn.after'"), next);
+}
+
 TEST_F(StoreDamageTest, SavedEventsKeepTheirAge)
 {
     constexpr double aDay = 86400;

@@ -162,6 +162,21 @@ TEST_F(UplinkOutbox, BeginsAnewWithAnotherDatabase)
     EXPECT_EQ(reader.next(batch->last, {}, 5000)->first, (Cursor{"new", 1}));
 }
 
+// What left before the damage must not leave once more under the new epoch.
+TEST_F(UplinkOutbox, GoesOnInTheDatabaseThatHasTheSavedRowsOfADamagedOne)
+{
+    MadeEventStore store(database);
+    for (int count = 0; count < 9; ++count)
+        store.addEvent(start);
+    store.execute(
+        "CREATE TABLE earlier_store(row INTEGER PRIMARY KEY, epoch TEXT NOT NULL, next_event INTEGER NOT NULL);"
+        "INSERT INTO earlier_store VALUES (1, 'damaged', 7)");
+    EXPECT_EQ(outbox().next({"damaged", 4}, {}, 5000)->first, (Cursor{epoch, 5}));
+    EXPECT_EQ(outbox().next({"damaged", 8}, {}, 5000)->first, (Cursor{epoch, 7})); // 7 and 8 are other rows here
+    EXPECT_EQ(outbox().next({"damaged", 0}, {}, 5000)->first, (Cursor{epoch, 1}));
+    EXPECT_EQ(outbox().next({"another", 4}, {}, 5000)->first, (Cursor{epoch, 1}));
+}
+
 TEST_F(UplinkOutbox, FollowsADatabaseThatIsReplaced)
 {
     Outbox reader = outbox();

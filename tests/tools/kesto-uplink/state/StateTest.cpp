@@ -143,6 +143,8 @@ TEST_F(UplinkState, BeginsAnewWithAnotherDatabase)
     EXPECT_EQ(state.stored(), (Cursor{"f", 0}));
     EXPECT_TRUE(state.noteStored(as, {"f", 5}));
     EXPECT_EQ(state.stored(), (Cursor{"f", 5}));
+    EXPECT_TRUE(state.noteQueued(as, {.last = {"g", 90}, .first = 70, .rows = 1}, 20));
+    EXPECT_EQ(state.stored(), (Cursor{"g", 69}));
 }
 
 TEST_F(UplinkState, GoesBackToWhatIsStored)
@@ -268,7 +270,7 @@ TEST_F(UplinkState, LosesNothingWhenItIsKilled)
                 const Identity as = state.identity();
                 const std::int64_t first = state.queued().id;
                 for (std::int64_t id = first + 1; state.noteQueued(as, sent("e", id), 20); ++id)
-                    std::ofstream(told) << id << std::endl;
+                    std::ofstream(told) << id << '\n' << std::flush;
                 return false;
             });
             ::usleep(20'000 + attempt * 3000);

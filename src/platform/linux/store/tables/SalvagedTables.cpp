@@ -1,6 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // New kinds and holders get numbers far above those that are saved: a message that is copied later may refer to one
 // that could not be read. Until the end a row without meaning holds that place.
+//
+// A reader that knows the damaged database by its epoch learns from `earlier_store` which rows it has read before.
 #include "platform/linux/store/tables/SalvagedTables.h"
 
 #include "platform/linux/store/tables/StoreSchema.h"
@@ -29,6 +31,10 @@ constexpr std::string_view goOn =
     " (SELECT age_time, wall_time, away, trial, away_below FROM saved_store)"
     " WHERE age_time < (SELECT age_time FROM saved_store);"
     "UPDATE store SET age_time = max(age_time, (SELECT coalesce(max(kept), 0) FROM ages));"
+    "CREATE TABLE IF NOT EXISTS earlier_store("
+    "row INTEGER PRIMARY KEY CHECK (row = 1), epoch TEXT NOT NULL, next_event INTEGER NOT NULL"
+    ") STRICT;"
+    "INSERT OR IGNORE INTO earlier_store SELECT 1, epoch, (SELECT next_event FROM store) FROM saved_store;"
     "DROP TABLE saved_store;"
     "DELETE FROM open_stretches;"
     "INSERT INTO kinds(id, name) SELECT 1000000 + coalesce(max(id), 0), '' FROM kinds"
