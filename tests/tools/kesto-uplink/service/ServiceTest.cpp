@@ -95,6 +95,7 @@ protected:
     {
         const std::string newest = "SELECT epoch || ':' || (next_event - 1) FROM store";
         return waitUntil([&] {
+            std::this_thread::sleep_for(std::chrono::milliseconds(50)); // a look locks the state
             auto state = kesto_uplink::State::openPresent(uplink.state());
             const auto queued = state ? state->queued() : kesto_uplink::Cursor();
             return fmt::format("{}:{}", queued.epoch, queued.id) == kestod.query(newest).at(0);
@@ -153,7 +154,10 @@ TEST_F(UplinkService, WhatIsAllowedIsInTheStreamOnceWhateverIsKilled)
     nats.publish("kesto.stored.alpha." + state->identity().pseudonym,
                  fmt::format(R"({{"epoch":"{}","id":{}}})", queued.epoch, queued.id));
     report(1);
-    EXPECT_TRUE(waitUntil([&] { return state->stored().id >= queued.id; }));
+    EXPECT_TRUE(waitUntil([&] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        return state->stored().id >= queued.id;
+    }));
 
     uplink.signal(SIGTERM);
     EXPECT_EQ(uplink.exitStatus(), 0);
