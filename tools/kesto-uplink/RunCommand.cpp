@@ -26,6 +26,7 @@
 #include <csignal>
 #include <cstdio>
 #include <cstdlib>
+#include <ctime>
 #include <future>
 #include <memory>
 #include <mutex>
@@ -51,9 +52,12 @@ double wallClock()
     return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
 }
 
+// Nobody sets this clock, and it goes on while the device sleeps.
 double uptime()
 {
-    return std::chrono::duration<double>(std::chrono::steady_clock::now().time_since_epoch()).count();
+    timespec now{};
+    ::clock_gettime(CLOCK_BOOTTIME, &now);
+    return static_cast<double>(now.tv_sec);
 }
 
 class OutboxSource : public Source {
@@ -89,11 +93,12 @@ std::optional<std::string> reasonToBeOff(const Places& places, const CheckedUpli
 // start.
 class Service {
 public:
-    explicit Service(const Places& places)
+    Service(const Places& places, double interval)
         : places_(places),
           state_(State::open(places.state, wallClock())),
           patience_(places.state / "waiting-since"),
-          sleep_(places.database)
+          sleep_(places.database),
+          schedule_(interval, [this] { return std::uniform_real_distribution(0.0, 1.0)(generator_); })
     {
     }
 
@@ -186,8 +191,7 @@ private:
     Patience patience_;
     StoreSleep sleep_;
     std::mt19937_64 generator_{std::random_device{}()};
-    Schedule schedule_{UplinkConfiguration().intervalSeconds,
-                       [this] { return std::uniform_real_distribution(0.0, 1.0)(generator_); }};
+    Schedule schedule_;
     DayCount days_;
     Diary diary_;
     bool saidUnknown_ = false;
@@ -206,11 +210,11 @@ sigset_t endingSignals()
     return signals;
 }
 
-int serve(const Places& places)
+int serve(const Places& places, double interval)
 {
     const sigset_t signals = endingSignals();
     ::pthread_sigmask(SIG_BLOCK, &signals, nullptr); // in all threads to come
-    Service service(places);
+    Service service(places, interval);
     ::sd_notify(0, "READY=1\nSTATUS=waiting for the first round");
     auto rounds = std::async(std::launch::async, [&service] {
         try {
@@ -246,7 +250,7 @@ int run(const Places& places)
         log(error.what());
         return EX_CONFIG;
     }
-    return serve(places);
+    return serve(places, checked.configuration.intervalSeconds);
 }
 
 } // namespace

@@ -147,20 +147,28 @@ TEST_F(UplinkService, WhatIsAllowedIsInTheStreamOnceWhateverIsKilled)
     EXPECT_GE(expected.size(), 120U); // each message becomes two events
     EXPECT_EQ(keysInStream(), expected);
 
-    // The fleet's store has it all: the device forgets.
-    auto state = kesto_uplink::State::openPresent(uplink.state());
-    const auto queued = state->queued();
-    EXPECT_NE(state->stored(), queued);
-    nats.publish("kesto.stored.alpha." + state->identity().pseudonym,
-                 fmt::format(R"({{"epoch":"{}","id":{}}})", queued.epoch, queued.id));
-    report(1);
-    EXPECT_TRUE(waitUntil([&] {
-        std::this_thread::sleep_for(std::chrono::milliseconds(50));
-        return state->stored().id >= queued.id;
-    }));
-
     uplink.signal(SIGTERM);
     EXPECT_EQ(uplink.exitStatus(), 0);
+}
+
+TEST_F(UplinkService, TheDeviceForgetsWhatTheFleetsStoreHas)
+{
+    std::string configuration = support::readFile(uplink.state() / "uplink.toml");
+    configuration.replace(configuration.find("queued"), 6, "stored");
+    uplink.writeConfiguration(configuration);
+    proxy.holdNoMore();
+    report(5);
+    uplink.start();
+    ASSERT_TRUE(isAllQueued());
+    auto state = *kesto_uplink::State::openPresent(uplink.state());
+    const auto queued = state.queued();
+    EXPECT_EQ(state.stored(), (kesto_uplink::Cursor{queued.epoch, 0}));
+    nats.publish("kesto.stored.alpha." + state.identity().pseudonym,
+                 fmt::format(R"({{"epoch":"{}","id":{}}})", queued.epoch, queued.id));
+    EXPECT_TRUE(waitUntil([&] {
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        return state.stored() == queued;
+    }));
 }
 
 // New events come between the kills, so a batch may have more rows when it is sent again: then it is another message,

@@ -17,9 +17,10 @@ namespace uplink_test {
 UplinkProcess::UplinkProcess(std::filesystem::path database, const std::string& server) : database_(std::move(database))
 {
     writeCredentials("name = \"alpha\"\npassword = \"secret\"\nplain = true\n");
-    writeConfiguration(fmt::format("enabled = true\nservers = [\"{}\"]\ncredentials = \"{}\"\ninterval = 0.2\n"
-                                   "[events.\"*\"]\n\"*\" = \"keep\"\n",
-                                   server, (directory_ / "credentials.toml").native()));
+    writeConfiguration(
+        fmt::format("enabled = true\nservers = [\"{}\"]\ncredentials = \"{}\"\ninterval = 0.2\nforget = \"queued\"\n"
+                    "[events.\"*\"]\n\"*\" = \"keep\"\n",
+                    server, (directory_ / "credentials.toml").native()));
 }
 
 UplinkProcess::~UplinkProcess()

@@ -13,7 +13,7 @@ namespace uplink_test {
 // One thread. The process ends with this object, if it has not ended before.
 class UplinkProcess {
 public:
-    // Everything of the store may leave; a round comes each fifth of a second.
+    // Everything of the store may leave; a round comes each fifth of a second, and waits for no confirmation.
     UplinkProcess(std::filesystem::path database, const std::string& server);
     ~UplinkProcess();
     UplinkProcess(const UplinkProcess&) = delete;
