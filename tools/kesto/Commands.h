@@ -31,3 +31,4 @@ void addStatusCommand(CLI::App& application, int& exitStatus);
 void addSummaryCommand(CLI::App& application, int& exitStatus);
 void addTopCommand(CLI::App& application, int& exitStatus);
 void addTraceCommand(CLI::App& application, int& exitStatus);
+void addUplinkCommand(CLI::App& application);

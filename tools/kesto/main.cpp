@@ -80,6 +80,7 @@ int main(int argumentCount, char** arguments)
     addSummaryCommand(application, exitStatus);
     addTopCommand(application, exitStatus);
     addTraceCommand(application, exitStatus);
+    addUplinkCommand(application);
     try {
         application.parse(argumentCount, arguments);
         if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0)

@@ -60,6 +60,8 @@ public:
     DatabaseWatch& operator=(const DatabaseWatch&) = delete;
     // False if the limit passed without a change; without a limit it waits for ever.
     [[nodiscard]] bool wait(std::optional<std::chrono::milliseconds> limit) const;
+    // For `poll`: can be read when `wait` would return.
+    [[nodiscard]] int descriptor() const noexcept { return inotify_; }
 
 private:
     int inotify_;

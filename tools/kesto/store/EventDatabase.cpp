@@ -101,17 +101,19 @@ platform::SqliteStatement EventDatabase::prepare(std::string_view sql)
     return platform::SqliteStatement(prepared);
 }
 
+bool EventDatabase::step(const platform::SqliteStatement& statement)
+{
+    const auto row = statement.step();
+    if (!row)
+        throw unreadable();
+    return *row;
+}
+
 void EventDatabase::forEachRow(const platform::SqliteStatement& statement,
                                const std::function<void(const platform::SqliteStatement&)>& visit)
 {
-    while (true) {
-        const auto row = statement.step();
-        if (!row)
-            throw unreadable();
-        if (!*row)
-            return;
+    while (step(statement))
         visit(statement);
-    }
 }
 
 void EventDatabase::execute(std::string_view sql)

@@ -35,6 +35,8 @@ public:
     bool refresh();
 
     [[nodiscard]] platform::SqliteStatement prepare(std::string_view sql);
+    // Goes to the statement's next row; false behind the last.
+    [[nodiscard]] bool step(const platform::SqliteStatement& statement);
     // Runs the statement to its end.
     void forEachRow(const platform::SqliteStatement& statement,
                     const std::function<void(const platform::SqliteStatement&)>& visit);

@@ -81,16 +81,43 @@ Value valueOf(const toml::node& node)
     return {};
 }
 
+TomlError errorOf(const toml::parse_error& error)
+{
+    const toml::source_position where = error.source().begin;
+    return {where.line, where.column, std::string(error.description())};
+}
+
+// The depth of tables is limited by toml++.
+void addLines(const toml::table& table, std::vector<std::string>& way, TomlLines& lines)
+{
+    for (const auto& [key, node] : table) {
+        way.emplace_back(key.str());
+        lines[way] = key.source().begin.line;
+        if (const toml::table* const inner = node.as_table())
+            addLines(*inner, way, lines);
+        way.pop_back();
+    }
+}
+
 } // namespace
 
 std::expected<Dictionary, TomlError> parseToml(std::string_view text)
 {
     const toml::parse_result result = toml::parse(text);
-    if (result)
-        return dictionaryOf(result.table());
-    const toml::parse_error& error = result.error();
-    const toml::source_position where = error.source().begin;
-    return std::unexpected(TomlError{where.line, where.column, std::string(error.description())});
+    if (!result)
+        return std::unexpected(errorOf(result.error()));
+    return dictionaryOf(result.table());
+}
+
+std::expected<TomlDocument, TomlError> parseTomlWithLines(std::string_view text)
+{
+    const toml::parse_result result = toml::parse(text);
+    if (!result)
+        return std::unexpected(errorOf(result.error()));
+    TomlDocument document{.values = dictionaryOf(result.table()), .lines = {}};
+    std::vector<std::string> way;
+    addLines(result.table(), way, document.lines);
+    return document;
 }
 
 bool TomlFile::reload()

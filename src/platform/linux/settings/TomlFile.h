@@ -11,9 +11,11 @@
 #include <cstddef>
 #include <expected>
 #include <filesystem>
+#include <map>
 #include <string>
 #include <string_view>
 #include <system_error>
+#include <vector>
 
 namespace platform {
 
@@ -27,6 +29,17 @@ struct TomlError {
 // TOML 1.0 as values, tables in the order of their keys. A date, with or without time, is a `Date`, in UTC unless it
 // names an offset; a time of day without a date stays text. Any thread.
 [[nodiscard]] std::expected<foundation::Dictionary, TomlError> parseToml(std::string_view text);
+
+// A key's way through the tables, and the line in which it stands first.
+using TomlLines = std::map<std::vector<std::string>, unsigned>;
+
+struct TomlDocument {
+    foundation::Dictionary values;
+    TomlLines lines;
+};
+
+// The same with the lines of all keys, for messages that name them. Any thread.
+[[nodiscard]] std::expected<TomlDocument, TomlError> parseTomlWithLines(std::string_view text);
 
 // One thread at a time.
 class TomlFile {

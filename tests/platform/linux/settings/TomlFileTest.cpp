@@ -65,6 +65,25 @@ TEST(ParseTomlTest, ArraysAndTablesNest)
                           {"z", Dictionary()}}));
 }
 
+TEST(ParseTomlTest, KeysStandInLines)
+{
+    const auto document =
+        parseTomlWithLines("a = 1\n\n[t]\nb = 2\n[t.\"x.y\"]\nc = { d = 3 }\nf.g = 4\n[[l]]\nm = 5\n");
+    ASSERT_TRUE(document);
+    EXPECT_EQ(document->values.find("a")->text(), "1");
+    EXPECT_EQ(document->lines,
+              (TomlLines{{{"a"}, 1},
+                         {{"t"}, 3},
+                         {{"t", "b"}, 4},
+                         {{"t", "x.y"}, 5},
+                         {{"t", "x.y", "c"}, 6},
+                         {{"t", "x.y", "c", "d"}, 6},
+                         {{"t", "x.y", "f"}, 7},
+                         {{"t", "x.y", "f", "g"}, 7},
+                         {{"l"}, 8}}));
+    EXPECT_EQ(parseTomlWithLines("a = 1\nb = ").error().line, 2U);
+}
+
 TEST(ParseTomlTest, DatesAreMomentsInUtcUnlessTheyNameAnOffset)
 {
     EXPECT_EQ(parsedValue("1970-01-02"), Value(Date{86400}));

@@ -18,7 +18,6 @@ namespace platform {
 class Pseudonyms {
 public:
     static constexpr std::string_view fileName = "applications.key";
-    static constexpr std::size_t keyBytes = 32;
 
     // Reads the key of the directory, or makes it. Without a key that lasts, it takes one that this process forgets,
     // and logs why.
@@ -26,7 +25,7 @@ public:
     // With this key.
     explicit Pseudonyms(std::string key) : key_(std::move(key)) { }
 
-    // "app-" and 16 hexadecimal digits: the first 64 bits of the name's HMAC-SHA-256 (RFC 2104, FIPS 180-4).
+    // "app-" and the name's `keyedHash`.
     [[nodiscard]] std::string of(std::string_view name) const;
 
 private:
