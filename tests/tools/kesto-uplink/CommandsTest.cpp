@@ -109,7 +109,7 @@ TEST_F(UplinkCommands, PreviewPrintsWhatIsSent)
     }
     const Finished preview = run({"preview"});
     EXPECT_EQ(std::regex_replace(preview.output, std::regex("\"sent\":[0-9.]+"), "\"sent\":0"), sent);
-    EXPECT_THAT(preview.errors, HasSubstr("4900 rows would leave (batches: 2; compressed: "));
+    EXPECT_THAT(preview.errors, HasSubstr("4900 rows would leave (batches: 3; compressed: "));
 }
 
 TEST_F(UplinkCommands, PreviewGoesBackToATime)

@@ -15,6 +15,7 @@ std::string compressed(std::string_view text)
     if (ZSTD_isError(size) != 0)
         throw std::bad_alloc(); // nothing else can fail
     result.resize(size);
+    result.shrink_to_fit();
     return result;
 }
 

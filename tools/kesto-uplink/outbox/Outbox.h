@@ -47,11 +47,12 @@ struct Batch {
     [[nodiscard]] Progress progress() const;
 };
 
+// A batch is as large as a device with little memory makes it without pain: some 50 KB compressed.
 struct OutboxLimits {
     std::size_t compressedBytes = std::size_t{512} * 1024;
     std::size_t wholeBytes = std::size_t{8} * 1024 * 1024; // before they are compressed
-    std::size_t rowBytes = std::size_t{1024} * 1024; // of events and stretches, but at least one of them
-    std::int64_t rows = 4096; // the same
+    std::size_t rowBytes = std::size_t{512} * 1024; // of events and stretches, but at least one of them
+    std::int64_t rows = 2048; // the same
     std::int64_t rowsLookedAt = 65'536; // for one batch
     std::int64_t endedSessions = 1024; // those of which the batch has nothing else
     StoreReader::Limits slice = {};

@@ -65,8 +65,8 @@ public:
     explicit StoreReader(std::filesystem::path database) : file_(std::move(database)) { }
 
     struct Limits {
-        std::int64_t rows = 2048;
-        std::int64_t payloadBytes = 1024 * 1024; // but at least one event
+        std::int64_t rows = 1024;
+        std::int64_t payloadBytes = 256 * 1024; // but at least one event
     };
     // What comes behind the cursor. If it is of another database, the slice begins with the oldest row of this one; but
     // if this one was made to save the rows of that one, the slice goes on behind the cursor's ID. Nothing if nothing
