@@ -15,14 +15,8 @@
 namespace kesto_ingest {
 
 struct Configuration {
-    JetStreamConfiguration stream{.servers = {"nats://127.0.0.1:4222"},
-                                  .user = {},
-                                  .password = {},
-                                  .nkey = {},
-                                  .nkeySeedFile = {},
-                                  .certificateAuthority = {}};
-    ClickHouseConfiguration database{
-        .servers = {"http://127.0.0.1:8123"}, .user = {}, .password = {}, .certificateAuthority = {}, .settings = {}};
+    JetStreamConfiguration stream{.servers = {"nats://127.0.0.1:4222"}};
+    ClickHouseConfiguration database{.servers = {"http://127.0.0.1:8123"}};
     std::size_t rowsInABlock = 10'000; // as many are joined into one insert
     std::chrono::milliseconds longestJoining{1000}; // or what came in that time
     std::uint16_t metricsPort = 9464;

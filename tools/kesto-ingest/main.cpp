@@ -167,6 +167,7 @@ int main(int argumentCount, char** arguments)
     StreamSizes sizes;
     double eventsGigabytes = 8;
     double deadGigabytes = 1;
+    int redeliverSeconds = 60;
 
     CLI::App app("Takes the batches of a fleet from the stream and puts their rows into the database.", "kesto-ingest");
     app.set_version_flag("--version", "kesto-ingest " KESTO_VERSION);
@@ -184,6 +185,11 @@ int main(int argumentCount, char** arguments)
         ->capture_default_str();
     setUpCommand->add_option("--dead-gigabytes", deadGigabytes, "Room for what cannot be stored")
         ->check(CLI::Range(0.001, 1e6))
+        ->capture_default_str();
+    setUpCommand
+        ->add_option("--redeliver-seconds", redeliverSeconds,
+                     "After this time another copy gets what one has not acknowledged; below 20 for trials only")
+        ->check(CLI::Range(1, 3600))
         ->capture_default_str();
     const CLI::Validator isName(
         [](const std::string& text) {
@@ -208,6 +214,7 @@ int main(int argumentCount, char** arguments)
         }
         sizes.eventsBytes = static_cast<std::int64_t>(eventsGigabytes * gigabyte);
         sizes.deadBytes = static_cast<std::int64_t>(deadGigabytes * gigabyte);
+        sizes.redeliverAfter = std::chrono::seconds(redeliverSeconds);
         return setUpCommand->parsed() ? setUp(*configuration, sizes) : run(*configuration);
     } catch (const CLI::ParseError& error) {
         return app.exit(error) == 0 ? EX_OK : EX_USAGE;

@@ -132,12 +132,15 @@ ClickHouse::Answer ClickHouse::askServer(const std::string& server, const std::s
     return answer;
 }
 
-// An answer for the rows' own sake would be the same everywhere.
+// An answer for the rows' own sake would be the same everywhere. What a server answered says more than that another is
+// away.
 ClickHouse::Answer ClickHouse::ask(const std::string& query, std::string_view body)
 {
     Answer answer;
     for (std::size_t tried = 0; tried < configuration_.servers.size(); ++tried) {
-        answer = askServer(configuration_.servers[current_], query, body);
+        Answer next = askServer(configuration_.servers[current_], query, body);
+        if (next.status != 0 || answer.status == 0)
+            answer = std::move(next);
         if (answer.status == 200 || isFaultOfRows(answer.text))
             break;
         current_ = (current_ + 1) % configuration_.servers.size();

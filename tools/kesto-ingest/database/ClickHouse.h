@@ -16,11 +16,11 @@ namespace kesto_ingest {
 struct ClickHouseConfiguration {
     std::vector<std::string> servers; // such as "http://127.0.0.1:8123"
     std::string database = "kesto";
-    std::string user;
-    std::string password;
-    std::string certificateAuthority; // a file, for https; empty: those of the system
+    std::string user{};
+    std::string password{};
+    std::string certificateAuthority{}; // a file, for https; empty: those of the system
     std::chrono::seconds timeLimit{30}; // of one question
-    std::map<std::string, std::string> settings; // of each insert, such as insert_quorum
+    std::map<std::string, std::string> settings{}; // of each insert, such as insert_quorum
 
     friend bool operator==(const ClickHouseConfiguration&, const ClickHouseConfiguration&) = default;
 };

@@ -36,7 +36,7 @@ constexpr Column device = {fromRow, "device", "FixedString(32)", "the pseudonym"
 constexpr Column epoch = {fromRow, "epoch", "FixedString(32)",
                           "of the device's store: IDs mean something only with it"};
 constexpr Column id = {fromRow, "id", "UInt64", ""};
-constexpr Column session = {fromRow, "session", "UInt64", "an ID in sessions; 0: it belongs to none"};
+constexpr Column session = {fromRow, "session", "UInt64", "an ID in sessions, or 0: it belongs to none"};
 constexpr Column application = {fromRow, "application", "String", "empty: not known"};
 constexpr Column model = {fromRow, "model", "String", "of the device"};
 constexpr Column release = {fromRow, "version", "String", "the device's release"};

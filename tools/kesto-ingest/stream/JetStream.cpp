@@ -33,7 +33,6 @@ using OwnedMessage = Owned<natsMsg, natsMsg_Destroy>;
 using OwnedPublication = Owned<jsPubAck, jsPubAck_Destroy>;
 
 constexpr std::int64_t nanosecondsASecond = 1'000'000'000;
-constexpr std::int64_t acknowledgeWithin = 60 * nanosecondsASecond;
 constexpr std::int64_t giveBackAfter = 2000; // milliseconds
 constexpr std::int64_t rememberIdsFor = 120 * nanosecondsASecond;
 constexpr std::int64_t keepDeadFor = 90 * 86400 * nanosecondsASecond;
@@ -63,7 +62,7 @@ void keepLastWords(natsConnection* connection, natsSubscription*, natsStatus sta
 
 const char* streamOf(std::string_view subject)
 {
-    return subject.starts_with(ownerPrefix) ? ownerStream : storedStream;
+    return subject.starts_with(ownerPrefix) ? ownerStream : subject.starts_with(deadPrefix) ? deadStream : storedStream;
 }
 
 } // namespace
@@ -201,7 +200,7 @@ std::expected<void, std::string> JetStream::setUp(const StreamSizes& sizes)
     jsConsumerConfig_Init(&consumer);
     consumer.Durable = consumerName;
     consumer.AckPolicy = js_AckExplicit;
-    consumer.AckWait = acknowledgeWithin;
+    consumer.AckWait = sizes.redeliverAfter.count() * nanosecondsASecond;
     consumer.MaxDeliver = -1;
     consumer.MaxAckPending = mostUnacknowledged;
     if (const natsStatus status = js_AddConsumer(nullptr, context, eventsStream, &consumer, nullptr, nullptr);

@@ -13,11 +13,11 @@ namespace kesto_ingest {
 
 struct JetStreamConfiguration {
     std::vector<std::string> servers; // such as "nats://127.0.0.1:4222"
-    std::string user;
-    std::string password;
-    std::string nkey; // the public one; with the seed it takes the place of user and password
-    std::string nkeySeedFile;
-    std::string certificateAuthority; // a file; empty: no TLS
+    std::string user{};
+    std::string password{};
+    std::string nkey{}; // the public one; with the seed it takes the place of user and password
+    std::string nkeySeedFile{};
+    std::string certificateAuthority{}; // a file; empty: no TLS
     std::chrono::milliseconds timeLimit{5000}; // of one question
 
     friend bool operator==(const JetStreamConfiguration&, const JetStreamConfiguration&) = default;
@@ -28,6 +28,7 @@ struct StreamSizes {
     int replicas = 1;
     std::int64_t eventsBytes = std::int64_t{8} << 30; // waiting batches; then devices are refused, and wait
     std::int64_t deadBytes = std::int64_t{1} << 30; // then the oldest dead letters go
+    std::chrono::seconds redeliverAfter{60}; // what a copy neither acknowledges nor says that it works on
 };
 
 class JetStream : public Stream {
