@@ -16,7 +16,7 @@ namespace kesto_ingest {
 namespace {
 
 constexpr std::string_view knownEdition = "1";
-constexpr std::size_t mostFetched = 32; // batches
+constexpr std::size_t mostFetched = 8; // batches, of which each may become large
 constexpr std::chrono::milliseconds longestWait{1000};
 constexpr std::chrono::seconds holdOnEvery{10}; // of the 60 that the stream waits
 
@@ -60,7 +60,8 @@ void Ingest::takeWhatComes()
     if (!held_.empty())
         wait = std::min(wait,
                         std::chrono::ceil<std::chrono::milliseconds>(oldest_ + limits_.joining - surroundings_.now()));
-    auto deliveries = stream_.fetch(mostFetched, wait);
+    // The first comes at once; the stream gives several together, and may wait for the last of them.
+    auto deliveries = stream_.fetch(held_.empty() ? 1 : mostFetched, wait);
     metrics_.isStreamUp = deliveries.has_value();
     if (!deliveries) {
         metrics_.add(Counter::StreamFailures);
@@ -72,10 +73,10 @@ void Ingest::takeWhatComes()
 
 void Ingest::finish()
 {
-    if (auto stored = store(); stored)
+    const auto stored = store();
+    if (stored)
         return;
-    else
-        surroundings_.log(fmt::format("what was not stored goes back to the stream: {}", stored.error()));
+    surroundings_.log(fmt::format("what was not stored goes back to the stream: {}", stored.error()));
     for (const Held& held : held_)
         stream_.giveBack(held.delivery);
 }
@@ -96,11 +97,11 @@ bool Ingest::isDue() const
         && (rows_ >= limits_.rows || bytes_ >= limits_.bytes || surroundings_.now() - oldest_ >= limits_.joining);
 }
 
-void Ingest::refuse(Delivery delivery, Counter counter, std::string reason)
+void Ingest::refuse(Delivery& delivery, Counter counter, std::string reason)
 {
     metrics_.add(counter);
     surroundings_.log(fmt::format("the batch {} of {} is put aside: {}", delivery.sequence, delivery.subject, reason));
-    held_.push_back({.delivery = std::move(delivery), .badRows = {}, .refusal = std::move(reason), .confirmation = {}});
+    held_.push_back({.delivery = std::move(delivery), .refusal = std::move(reason)});
 }
 
 void Ingest::take(Delivery delivery)
@@ -113,15 +114,15 @@ void Ingest::take(Delivery delivery)
         oldest_ = heldOn_ = surroundings_.now();
     const std::string credential = credentialOf(delivery.subject);
     if (credential.empty())
-        return refuse(std::move(delivery), Counter::BatchesRefusedUnreadable,
+        return refuse(delivery, Counter::BatchesRefusedUnreadable,
                       "its subject does not end in the name of a credential");
     if (delivery.edition != knownEdition)
         return refuse(
-            std::move(delivery), Counter::BatchesRefusedUnreadable,
+            delivery, Counter::BatchesRefusedUnreadable,
             fmt::format("it is of edition \"{}\", and this program knows edition {}", delivery.edition, knownEdition));
     auto batch = readBatch(delivery.payload);
     if (!batch)
-        return refuse(std::move(delivery), Counter::BatchesRefusedUnreadable, batch.error());
+        return refuse(delivery, Counter::BatchesRefusedUnreadable, batch.error());
     const auto owner = owners_.claim(batch->device, credential);
     if (!owner) {
         metrics_.add(Counter::StreamFailures);
@@ -129,7 +130,7 @@ void Ingest::take(Delivery delivery)
         return stream_.giveBack(delivery);
     }
     if (*owner != credential)
-        return refuse(std::move(delivery), Counter::BatchesRefusedForged,
+        return refuse(delivery, Counter::BatchesRefusedForged,
                       fmt::format("its pseudonym {} belongs to the credential {}", batch->device, *owner));
     metrics_.add(Counter::RowsRefusedSchema, batch->badRows.size());
     for (const BadRow& row : batch->badRows)
@@ -137,7 +138,6 @@ void Ingest::take(Delivery delivery)
     const std::size_t source = held_.size();
     held_.push_back({.delivery = std::move(delivery),
                      .badRows = std::move(batch->badRows),
-                     .refusal = {},
                      .confirmation = {credential, batch->device, batch->epoch, batch->last}});
     for (const Row& row : batch->rows)
         addRow(row, source);
@@ -170,6 +170,9 @@ std::expected<void, std::string> Ingest::storeBlocks()
         for (const RefusedRow& row : *refused)
             held_[next.block.source(row.row)].badRows.push_back(
                 {row.reason, std::string(next.block.rows(row.row, row.row + 1))});
+        metrics_.lastStored =
+            std::chrono::duration_cast<std::chrono::seconds>(std::chrono::system_clock::now().time_since_epoch())
+                .count();
         metrics_.add(Counter::Inserts);
         metrics_.add(Counter::RowsRefusedDatabase, refused->size());
         metrics_.add(storedRows(next.table), next.block.size() - refused->size());
@@ -178,38 +181,53 @@ std::expected<void, std::string> Ingest::storeBlocks()
     return {};
 }
 
-std::expected<void, std::string> Ingest::answer(Held& held)
+std::expected<void, std::string> Ingest::putAside(Held& held)
 {
-    if (!held.refusal.empty()) {
-        if (auto put = putBatchAside(stream_, held.delivery, held.refusal); !put)
-            return put;
-    } else {
-        std::vector<DeadRow> dead;
-        for (const BadRow& row : held.badRows)
-            dead.push_back({row.reason, row.line});
-        if (auto put = putRowsAside(stream_, held.delivery, dead); !put)
-            return put;
-        if (auto told = confirmations_.tell(held.confirmation); !told)
-            return told;
-        metrics_.add(Counter::Confirmations);
-        metrics_.add(Counter::BatchesStored);
-    }
-    stream_.acknowledge(held.delivery);
-    return {};
+    if (held.isPutAside)
+        return {};
+    std::vector<DeadRow> dead;
+    for (const BadRow& row : held.badRows)
+        dead.push_back({row.reason, row.line});
+    auto put = held.refusal.empty() ? putRowsAside(stream_, held.delivery, dead)
+                                    : putBatchAside(stream_, held.delivery, held.refusal);
+    held.isPutAside = put.has_value();
+    return put;
+}
+
+std::expected<void, std::string> Ingest::tellDevices()
+{
+    std::vector<Confirmation> confirmations;
+    for (const Held& held : held_)
+        if (held.refusal.empty())
+            confirmations.push_back(held.confirmation);
+    auto told = confirmations_.tell(confirmations);
+    if (told)
+        metrics_.add(Counter::BatchesStored, confirmations.size());
+    return told;
 }
 
 std::expected<void, std::string> Ingest::store()
 {
     if (auto stored = storeBlocks(); !stored)
         return stored;
-    while (!held_.empty()) { // in the order in which they came, so that what a device is told grows
-        if (auto answered = answer(held_.front()); !answered) {
-            metrics_.add(Counter::StreamFailures);
-            metrics_.isStreamUp = false;
-            return answered;
-        }
-        held_.erase(held_.begin());
+    const auto answered = answer();
+    if (!answered) {
+        metrics_.add(Counter::StreamFailures);
+        metrics_.isStreamUp = false;
     }
+    return answered;
+}
+
+std::expected<void, std::string> Ingest::answer()
+{
+    for (Held& held : held_)
+        if (auto put = putAside(held); !put)
+            return put;
+    if (auto told = tellDevices(); !told)
+        return told;
+    for (const Held& held : held_)
+        stream_.acknowledge(held.delivery);
+    held_.clear();
     return {};
 }
 
@@ -228,8 +246,6 @@ void Ingest::succeed()
     nextAttempt_.reset();
     rows_ = bytes_ = 0;
     metrics_.waitingRows = 0;
-    metrics_.lastStored =
-        std::chrono::duration_cast<std::chrono::seconds>(std::chrono::system_clock::now().time_since_epoch()).count();
 }
 
 } // namespace kesto_ingest

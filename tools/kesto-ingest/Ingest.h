@@ -55,9 +55,10 @@ public:
 private:
     struct Held {
         Delivery delivery;
-        std::vector<BadRow> badRows;
-        std::string refusal; // of the batch as a whole; empty: it is stored
-        Confirmation confirmation;
+        std::vector<BadRow> badRows{};
+        std::string refusal{}; // of the batch as a whole; empty: it is stored
+        Confirmation confirmation{};
+        bool isPutAside = false; // what is wrong with it
     };
     struct TableBlock {
         Table table;
@@ -66,12 +67,14 @@ private:
 
     void takeWhatComes();
     void take(Delivery delivery);
-    void refuse(Delivery delivery, Counter counter, std::string reason);
+    void refuse(Delivery& delivery, Counter counter, std::string reason);
     void addRow(const Row& row, std::size_t source);
     [[nodiscard]] bool isDue() const;
     [[nodiscard]] std::expected<void, std::string> store();
     [[nodiscard]] std::expected<void, std::string> storeBlocks();
-    [[nodiscard]] std::expected<void, std::string> answer(Held& held);
+    [[nodiscard]] std::expected<void, std::string> answer();
+    [[nodiscard]] std::expected<void, std::string> putAside(Held& held);
+    [[nodiscard]] std::expected<void, std::string> tellDevices();
     void fail(const std::string& reason);
     void succeed();
 

@@ -20,7 +20,7 @@ struct MetricRow {
 constexpr std::array<MetricRow, static_cast<std::size_t>(Counter::Count)> rows = {
     MetricRow{"kesto_ingest_batches_taken_total", "", "Batches that came from the stream."},
     MetricRow{"kesto_ingest_batches_repeated_total", "", "Those of them that came before, to this copy or another."},
-    MetricRow{"kesto_ingest_batches_stored_total", "", "Batches whose rows are stored."},
+    MetricRow{"kesto_ingest_batches_stored_total", "", "Batches whose rows are stored, and whose devices know it."},
     MetricRow{"kesto_ingest_batches_refused_total", "{reason=\"unreadable\"}",
               "Batches that were put aside as a whole."},
     MetricRow{"kesto_ingest_batches_refused_total", "{reason=\"forged\"}", ""},
@@ -34,7 +34,6 @@ constexpr std::array<MetricRow, static_cast<std::size_t>(Counter::Count)> rows =
     MetricRow{"kesto_ingest_inserts_total", "", "Blocks that the database has taken."},
     MetricRow{"kesto_ingest_insert_failures_total", "", "Attempts to store that failed; each is repeated."},
     MetricRow{"kesto_ingest_stream_failures_total", "", "Questions to the stream that failed; each is repeated."},
-    MetricRow{"kesto_ingest_confirmations_total", "", "Answers to devices: stored up to here."},
 };
 
 void append(std::string_view name, std::string_view label, std::string_view type, std::string_view help,

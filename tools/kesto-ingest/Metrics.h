@@ -25,7 +25,6 @@ enum class Counter : std::uint8_t {
     Inserts,
     InsertFailures,
     StreamFailures,
-    Confirmations,
     Count
 };
 

@@ -84,6 +84,21 @@ TEST_F(IngestTest, JoinsManyBatchesIntoOneInsert)
     EXPECT_THAT(database.blocks, SizeIs(2)) << "one of events, one of batches";
 }
 
+TEST_F(IngestTest, TellsADeviceOnceOfSeveralBatches)
+{
+    ingest = makeIngest({.joining = milliseconds{1000}});
+    for (int batch = 1; batch <= 5; ++batch) {
+        send(deviceLine(batch, batch) + eventLine(batch));
+        turns(1);
+    }
+    now += milliseconds{1000};
+    turns(1);
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":5})");
+    EXPECT_EQ(stream.puts, 2) << "the owner, and one answer";
+    EXPECT_EQ(metrics.count(Counter::BatchesStored), 5U);
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+}
+
 TEST_F(IngestTest, WaitsForNobodyWithEnoughRows)
 {
     ingest = makeIngest({.rows = 4, .joining = milliseconds{1000}});
@@ -111,7 +126,7 @@ TEST_F(IngestTest, PutsAsideRowsThatTheDatabaseRefuses)
     database.refusedWord = R"("id":4)";
     send(deviceLine(1, 3) + eventLine(3), "one");
     send(deviceLine(4, 5, deviceB) + eventLine(4, deviceB) + eventLine(5, deviceB), "two");
-    turns(2);
+    turns(6);
     EXPECT_THAT(database.tables["events"], SizeIs(2));
     ASSERT_THAT(stream.letters, SizeIs(1));
     EXPECT_EQ(stream.letters[0].subject, "kesto.dead.two");
@@ -126,7 +141,7 @@ TEST_F(IngestTest, PutsAsideBatchesThatCannotBeRead)
     stream.send("kesto.events.one", "nonsense");
     stream.send("kesto.events.one", compressed(deviceLine(1, 9)), "2");
     stream.send("kesto.events.one.two", compressed(deviceLine(1, 9)));
-    turns(2);
+    turns(6);
     ASSERT_THAT(stream.letters, SizeIs(3));
     EXPECT_EQ(stream.letters[0].payload, "nonsense");
     EXPECT_EQ(stream.letters[0].headers["Kesto-Reason"], "it is not compressed with zstd");
@@ -141,7 +156,7 @@ TEST_F(IngestTest, RefusesAPseudonymThatAnotherCredentialUsedFirst)
 {
     send(deviceLine(1, 3) + eventLine(3), "one");
     send(deviceLine(4, 5) + eventLine(4), "two");
-    turns(2);
+    turns(6);
     EXPECT_THAT(database.tables["events"], SizeIs(1));
     EXPECT_EQ(metrics.count(Counter::BatchesRefusedForged), 1U);
     ASSERT_THAT(stream.letters, SizeIs(1));

@@ -7,6 +7,9 @@
 #include <fmt/format.h>
 #include <rapidjson/document.h>
 
+#include <iterator>
+#include <vector>
+
 namespace kesto_ingest {
 
 namespace {
@@ -34,34 +37,59 @@ std::expected<Confirmations::Told, std::string> Confirmations::look(const std::s
     return told;
 }
 
-std::expected<void, std::string> Confirmations::tell(const Confirmation& confirmation)
+std::expected<void, std::string> Confirmations::leaveOutWhatIsTold(Waiting& waiting)
 {
-    const std::string subject = fmt::format("{}{}.{}", storedPrefix, confirmation.credential, confirmation.device);
-    const std::string text = fmt::format(R"({{"epoch":"{}","id":{}}})", confirmation.epoch, confirmation.id);
-    if (told_.size() >= mostTold)
-        told_.clear();
-    for (int attempt = 0; attempt < mostAttempts; ++attempt) {
+    for (auto next = waiting.begin(); next != waiting.end();) {
+        const auto& [subject, confirmation] = *next;
         if (!told_.contains(subject)) {
             auto told = look(subject);
             if (!told)
                 return std::unexpected(told.error());
             told_[subject] = *std::move(told);
         }
-        Told& told = told_[subject];
-        if (told.epoch == confirmation.epoch && told.id >= confirmation.id)
-            return {};
-        const auto sequence = stream_.put(subject, text, told.sequence);
-        if (!sequence) {
-            told_.erase(subject); // it may be there
-            return std::unexpected(sequence.error());
-        }
-        if (*sequence) {
-            told = {.epoch = confirmation.epoch, .id = confirmation.id, .sequence = **sequence};
-            return {};
-        }
-        told_.erase(subject);
+        const Told& told = told_[subject];
+        next = told.epoch == confirmation->epoch && told.id >= confirmation->id ? waiting.erase(next) : std::next(next);
     }
-    return std::unexpected("others change what is told to " + subject + " without end");
+    return {};
+}
+
+// What stays waiting was overtaken by another copy.
+std::expected<void, std::string> Confirmations::put(Waiting& waiting)
+{
+    std::vector<Put> puts;
+    for (const auto& [subject, confirmation] : waiting)
+        puts.push_back({.subject = subject,
+                        .payload = fmt::format(R"({{"epoch":"{}","id":{}}})", confirmation->epoch, confirmation->id),
+                        .after = told_[subject].sequence});
+    const auto answers = stream_.put(puts);
+    for (std::size_t place = 0; place < puts.size(); ++place) {
+        const std::string& subject = puts[place].subject;
+        if (answers && (*answers)[place]) {
+            const Confirmation& confirmation = *waiting[subject];
+            told_[subject] = {.epoch = confirmation.epoch, .id = confirmation.id, .sequence = *(*answers)[place]};
+            waiting.erase(subject);
+        } else
+            told_.erase(subject);
+    }
+    return answers ? std::expected<void, std::string>() : std::unexpected(answers.error());
+}
+
+std::expected<void, std::string> Confirmations::tell(std::span<const Confirmation> confirmations)
+{
+    if (told_.size() >= mostTold)
+        told_.clear();
+    Waiting waiting;
+    for (const Confirmation& each : confirmations)
+        waiting[fmt::format("{}{}.{}", storedPrefix, each.credential, each.device)] = &each;
+    for (int attempt = 0; attempt < mostAttempts; ++attempt) {
+        if (auto left = leaveOutWhatIsTold(waiting); !left || waiting.empty())
+            return left;
+        if (auto done = put(waiting); !done)
+            return done;
+    }
+    if (waiting.empty())
+        return {};
+    return std::unexpected("others change what is told to " + waiting.begin()->first + " without end");
 }
 
 } // namespace kesto_ingest

@@ -6,6 +6,8 @@
 
 #include <cstdint>
 #include <expected>
+#include <map>
+#include <span>
 #include <string>
 #include <unordered_map>
 
@@ -23,8 +25,9 @@ class Confirmations {
 public:
     explicit Confirmations(Stream& stream) : stream_(stream) { }
 
-    // Within an epoch what is told never goes back, whatever other copies tell.
-    [[nodiscard]] std::expected<void, std::string> tell(const Confirmation& confirmation);
+    // Within an epoch what is told never goes back, whatever other copies tell. The last of several for one device
+    // counts.
+    [[nodiscard]] std::expected<void, std::string> tell(std::span<const Confirmation> confirmations);
 
 private:
     struct Told {
@@ -33,6 +36,10 @@ private:
         std::uint64_t sequence = 0; // 0: nothing is told
     };
 
+    using Waiting = std::map<std::string, const Confirmation*>; // by subject
+
+    [[nodiscard]] std::expected<void, std::string> leaveOutWhatIsTold(Waiting& waiting);
+    [[nodiscard]] std::expected<void, std::string> put(Waiting& waiting);
     [[nodiscard]] std::expected<Told, std::string> look(const std::string& subject);
 
     Stream& stream_;

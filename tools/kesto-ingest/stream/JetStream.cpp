@@ -9,7 +9,9 @@
 
 #include <fmt/format.h>
 #include <nats/nats.h>
+#include <rapidjson/document.h>
 
+#include <algorithm>
 #include <array>
 #include <cstring>
 #include <mutex>
@@ -30,7 +32,6 @@ using OwnedConnection = Owned<natsConnection, natsConnection_Destroy>;
 using OwnedContext = Owned<jsCtx, jsCtx_Destroy>;
 using OwnedSubscription = Owned<natsSubscription, natsSubscription_Destroy>;
 using OwnedMessage = Owned<natsMsg, natsMsg_Destroy>;
-using OwnedPublication = Owned<jsPubAck, jsPubAck_Destroy>;
 
 constexpr std::int64_t nanosecondsASecond = 1'000'000'000;
 constexpr std::int64_t giveBackAfter = 2000; // milliseconds
@@ -63,6 +64,35 @@ void keepLastWords(natsConnection* connection, natsSubscription*, natsStatus sta
 const char* streamOf(std::string_view subject)
 {
     return subject.starts_with(ownerPrefix) ? ownerStream : subject.starts_with(deadPrefix) ? deadStream : storedStream;
+}
+
+natsStatus sendPut(natsConnection& connection, const Put& put, const std::string& answerTo)
+{
+    natsMsg* made = nullptr;
+    natsStatus status = natsMsg_Create(&made, put.subject.c_str(), answerTo.c_str(), put.payload.data(),
+                                       static_cast<int>(put.payload.size()));
+    const OwnedMessage message(made);
+    if (status == NATS_OK)
+        status = natsMsgHeader_Set(made, "Nats-Expected-Last-Subject-Sequence", fmt::format("{}", put.after).c_str());
+    return status == NATS_OK ? natsConnection_PublishMsg(&connection, made) : status;
+}
+
+std::expected<PutAnswer, std::string> readPutAnswer(natsMsg* message)
+{
+    if (natsMsg_IsNoResponders(message))
+        return std::unexpected("no server has the stream");
+    rapidjson::Document answer;
+    answer.Parse(natsMsg_GetData(message), static_cast<std::size_t>(natsMsg_GetDataLength(message)));
+    if (answer.IsObject() && answer.HasMember("seq") && answer["seq"].IsUint64() && !answer.HasMember("error"))
+        return answer["seq"].GetUint64();
+    if (!answer.IsObject() || !answer.HasMember("error") || !answer["error"].IsObject())
+        return std::unexpected("its answer cannot be read");
+    const auto& error = answer["error"];
+    if (error.HasMember("err_code") && error["err_code"].IsInt()
+        && error["err_code"].GetInt() == JSStreamWrongLastSequenceErr)
+        return std::nullopt;
+    const bool hasText = error.HasMember("description") && error["description"].IsString();
+    return std::unexpected(hasText ? error["description"].GetString() : "it does not say why");
 }
 
 } // namespace
@@ -98,6 +128,8 @@ struct JetStream::Connection {
         return {};
     }
 
+    std::chrono::milliseconds timeLimit{};
+    std::string inboxes = "_INBOX"; // the beginning of their names
     LastWords words;
     OwnedConnection connection;
     OwnedContext context;
@@ -106,6 +138,7 @@ struct JetStream::Connection {
 
 JetStream::JetStream(const JetStreamConfiguration& configuration) : connection_(std::make_unique<Connection>())
 {
+    connection_->timeLimit = configuration.timeLimit;
     natsOptions* made = nullptr;
     natsStatus status = natsOptions_Create(&made);
     const OwnedOptions options(made);
@@ -122,6 +155,9 @@ JetStream::JetStream(const JetStreamConfiguration& configuration) : connection_(
     set(natsOptions_SetMaxReconnect, made, -1);
     set(natsOptions_SetReconnectWait, made, std::int64_t{250});
     set(natsOptions_SetFailRequestsOnDisconnect, made, true);
+    if (!configuration.user.empty()) // so that permissions can keep others from reading the answers
+        connection_->inboxes += '_' + configuration.user;
+    set(natsOptions_SetCustomInboxPrefix, made, connection_->inboxes.c_str());
     set(natsOptions_SetErrorHandler, made, &keepLastWords, static_cast<void*>(&connection_->words));
     if (!configuration.nkey.empty())
         set(natsOptions_SetNKeyFromSeed, made, configuration.nkey.c_str(), configuration.nkeySeedFile.c_str());
@@ -274,24 +310,50 @@ std::expected<std::optional<Entry>, std::string> JetStream::last(const std::stri
                  .sequence = natsMsg_GetSequence(got)};
 }
 
-std::expected<std::optional<std::uint64_t>, std::string> JetStream::put(const std::string& subject,
-                                                                        std::string_view payload, std::uint64_t after)
+std::expected<std::vector<PutAnswer>, std::string> JetStream::put(std::span<const Put> puts)
 {
-    jsPubOptions options;
-    jsPubOptions_Init(&options);
-    options.ExpectStream = streamOf(subject);
-    options.ExpectLastSubjectSeq = after;
-    options.ExpectNoMessage = after == 0;
-    jsPubAck* made = nullptr;
-    jsErrCode code{};
-    const natsStatus status = js_Publish(&made, connection_->context.get(), subject.c_str(), payload.data(),
-                                         static_cast<int>(payload.size()), &options, &code);
-    const OwnedPublication publication(made);
-    if (status != NATS_OK && code == JSStreamWrongLastSequenceErr)
-        return std::nullopt;
+    constexpr std::size_t mostAtOnce = 256; // less than a subscription holds
+    std::vector<PutAnswer> answers(puts.size());
+    for (std::size_t first = 0; first < puts.size(); first += mostAtOnce) {
+        const std::size_t count = std::min(mostAtOnce, puts.size() - first);
+        if (auto done = putSome(puts.subspan(first, count), std::span(answers).subspan(first, count)); !done)
+            return std::unexpected(done.error());
+    }
+    return answers;
+}
+
+// libnats waits for the answer to each message, or loses answers; so the answers come to an inbox of their own.
+std::expected<void, std::string> JetStream::putSome(std::span<const Put> puts, std::span<PutAnswer> answers)
+{
+    natsInbox* madeInbox = nullptr;
+    natsStatus status = natsInbox_Create(&madeInbox);
+    const Owned<natsInbox, natsInbox_Destroy> inbox(madeInbox);
+    constexpr std::size_t usualBeginning = std::string_view("_INBOX").size();
+    const std::string beginning =
+        status == NATS_OK ? connection_->inboxes + (madeInbox + usualBeginning) + '.' : std::string();
+    natsSubscription* madeSubscription = nullptr;
+    if (status == NATS_OK)
+        status =
+            natsConnection_SubscribeSync(&madeSubscription, connection_->connection.get(), (beginning + '*').c_str());
+    const OwnedSubscription subscription(madeSubscription);
+    for (std::size_t place = 0; place < puts.size() && status == NATS_OK; ++place)
+        status = sendPut(*connection_->connection, puts[place], beginning + fmt::format("{}", place));
+    for (std::size_t count = 0; count < puts.size() && status == NATS_OK; ++count) {
+        natsMsg* got = nullptr;
+        status = natsSubscription_NextMsg(&got, madeSubscription, connection_->timeLimit.count());
+        const OwnedMessage message(got);
+        if (status != NATS_OK)
+            break;
+        const std::size_t place = std::stoul(std::string(natsMsg_GetSubject(got)).substr(beginning.size()));
+        const auto answer = readPutAnswer(got);
+        if (!answer)
+            return std::unexpected(fmt::format("{} takes nothing: {}", streamOf(puts[place].subject), answer.error()));
+        answers[place] = *answer;
+    }
     if (status != NATS_OK)
-        return std::unexpected(connection_->reason(fmt::format("{} takes nothing", streamOf(subject)), status));
-    return publication->Sequence;
+        return std::unexpected(
+            connection_->reason(fmt::format("{} takes nothing", streamOf(puts.front().subject)), status));
+    return {};
 }
 
 std::expected<void, std::string> JetStream::publish(const std::string& subject, std::string_view payload,

@@ -46,13 +46,15 @@ public:
     void workGoesOn(const Delivery& delivery) override;
     void giveBack(const Delivery& delivery) override;
     [[nodiscard]] std::expected<std::optional<Entry>, std::string> last(const std::string& subject) override;
-    [[nodiscard]] std::expected<std::optional<std::uint64_t>, std::string>
-    put(const std::string& subject, std::string_view payload, std::uint64_t after) override;
+    [[nodiscard]] std::expected<std::vector<PutAnswer>, std::string> put(std::span<const Put> puts) override;
     [[nodiscard]] std::expected<void, std::string> publish(const std::string& subject, std::string_view payload,
                                                            const Headers& headers) override;
 
 private:
     struct Connection;
+
+    [[nodiscard]] std::expected<void, std::string> putSome(std::span<const Put> puts, std::span<PutAnswer> answers);
+
     std::unique_ptr<Connection> connection_;
 };
 

@@ -19,10 +19,11 @@ std::expected<std::string, std::string> Owners::claim(const std::string& device,
     const std::string subject = std::string(ownerPrefix) + device;
     auto entry = stream_.last(subject);
     if (entry && !*entry) {
-        const auto put = stream_.put(subject, credential, 0);
-        if (!put)
-            return std::unexpected(put.error());
-        entry = *put ? Entry{.payload = credential, .sequence = **put} : stream_.last(subject);
+        const Put first{.subject = subject, .payload = credential};
+        const auto answers = stream_.put({&first, 1});
+        if (!answers)
+            return std::unexpected(answers.error());
+        entry = answers->front() ? Entry{.payload = credential, .sequence = *answers->front()} : stream_.last(subject);
     }
     if (!entry)
         return std::unexpected(entry.error());

@@ -9,6 +9,7 @@
 #include <map>
 #include <memory>
 #include <optional>
+#include <span>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -31,6 +32,14 @@ struct Entry {
     std::uint64_t sequence = 0; // in its stream
 };
 
+// A message that is published if the last one of its subject is that one.
+struct Put {
+    std::string subject;
+    std::string payload;
+    std::uint64_t after = 0; // the sequence of the last; 0: there is none
+};
+using PutAnswer = std::optional<std::uint64_t>; // the sequence of the new one; none: the last is another
+
 using Headers = std::map<std::string, std::string>;
 
 // One thread. Errors are for a person.
@@ -51,10 +60,8 @@ public:
 
     // The last message of a subject, also one that another copy has just put there.
     [[nodiscard]] virtual std::expected<std::optional<Entry>, std::string> last(const std::string& subject) = 0;
-    // Publishes if the last message of the subject is that one; 0: if there is none. The answer is the sequence of the
-    // new one, or nothing if the last is another.
-    [[nodiscard]] virtual std::expected<std::optional<std::uint64_t>, std::string>
-    put(const std::string& subject, std::string_view payload, std::uint64_t after) = 0;
+    // Publishes each, without waiting for the one before. The error says that some may not be there.
+    [[nodiscard]] virtual std::expected<std::vector<PutAnswer>, std::string> put(std::span<const Put> puts) = 0;
     [[nodiscard]] virtual std::expected<void, std::string> publish(const std::string& subject, std::string_view payload,
                                                                    const Headers& headers) = 0;
 };

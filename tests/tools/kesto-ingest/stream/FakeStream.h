@@ -60,16 +60,21 @@ public:
         const auto entry = entries.find(subject);
         return entry == entries.end() ? std::nullopt : std::optional(entry->second);
     }
-    [[nodiscard]] std::expected<std::optional<std::uint64_t>, std::string>
-    put(const std::string& subject, std::string_view payload, std::uint64_t after) override
+    [[nodiscard]] std::expected<std::vector<PutAnswer>, std::string> put(std::span<const Put> asked) override
     {
         if (isAway)
             return std::unexpected("away");
-        Entry& entry = entries[subject];
-        if (entry.sequence != after)
-            return std::nullopt;
-        entry = {.payload = std::string(payload), .sequence = ++sequence_};
-        return entry.sequence;
+        std::vector<PutAnswer> answers;
+        for (const Put& each : asked) {
+            Entry& entry = entries[each.subject];
+            PutAnswer& answer = answers.emplace_back();
+            if (entry.sequence != each.after)
+                continue;
+            ++puts;
+            answer = ++sequence_;
+            entry = {.payload = each.payload, .sequence = *answer};
+        }
+        return answers;
     }
     [[nodiscard]] std::expected<void, std::string> publish(const std::string& subject, std::string_view payload,
                                                            const Headers& headers) override
@@ -94,6 +99,7 @@ public:
     bool isAway = false;
     bool isDeaf = false; // for what is published
     int toldThatWorkGoesOn = 0;
+    int puts = 0; // those that were taken
     std::map<std::string, Entry> entries;
     std::vector<Letter> letters;
 

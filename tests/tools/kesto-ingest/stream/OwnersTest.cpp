@@ -38,12 +38,13 @@ TEST(Owners, TheFirstKeepsThePseudonym)
 // A stream in which another copy is always faster by one question.
 class RacingStream : public FakeStream {
 public:
-    [[nodiscard]] std::expected<std::optional<std::uint64_t>, std::string>
-    put(const std::string& subject, std::string_view payload, std::uint64_t after) override
+    [[nodiscard]] std::expected<std::vector<PutAnswer>, std::string> put(std::span<const Put> asked) override
     {
-        if (std::exchange(isFaster, false))
-            static_cast<void>(FakeStream::put(subject, other, after));
-        return FakeStream::put(subject, payload, after);
+        if (std::exchange(isFaster, false)) {
+            const Put first{.subject = asked[0].subject, .payload = other, .after = asked[0].after};
+            static_cast<void>(FakeStream::put({&first, 1}));
+        }
+        return FakeStream::put(asked);
     }
     std::string other;
     bool isFaster = true;
@@ -66,28 +67,46 @@ TEST(Owners, NobodyOwnsWhatCannotBeAsked)
     EXPECT_EQ(owners.claim("d", "two"), "two");
 }
 
+bool tell(Confirmations& confirmations, std::string_view epoch, std::uint64_t id)
+{
+    const Confirmation confirmation{.credential = "one", .device = "d", .epoch = std::string(epoch), .id = id};
+    return confirmations.tell({&confirmation, 1}).has_value();
+}
+
 TEST(Confirmations, GoForwardWithinAnEpoch)
 {
     FakeStream stream;
     Confirmations confirmations(stream);
+    Confirmations others(stream);
     const auto told = [&] { return stream.entries["kesto.stored.one.d"].payload; };
-    EXPECT_TRUE(confirmations.tell({"one", "d", "e1", 10}));
+    EXPECT_TRUE(tell(confirmations, "e1", 10));
     EXPECT_EQ(told(), R"({"epoch":"e1","id":10})");
-    EXPECT_TRUE(confirmations.tell({"one", "d", "e1", 7}));
+    EXPECT_TRUE(tell(confirmations, "e1", 7));
     EXPECT_EQ(told(), R"({"epoch":"e1","id":10})");
-    EXPECT_TRUE(Confirmations(stream).tell({"one", "d", "e1", 8})) << "another copy";
+    EXPECT_TRUE(tell(others, "e1", 8));
     EXPECT_EQ(told(), R"({"epoch":"e1","id":10})");
-    EXPECT_TRUE(Confirmations(stream).tell({"one", "d", "e2", 3})) << "another copy";
+    EXPECT_TRUE(tell(others, "e2", 3));
     EXPECT_EQ(told(), R"({"epoch":"e2","id":3})");
-    EXPECT_TRUE(confirmations.tell({"one", "d", "e2", 4})) << "after the other copy";
+    EXPECT_TRUE(tell(confirmations, "e2", 4)) << "after the other copy";
     EXPECT_EQ(told(), R"({"epoch":"e2","id":4})");
+}
+
+TEST(Confirmations, TellSeveralDevicesAtOnce)
+{
+    FakeStream stream;
+    const std::vector<Confirmation> several = {{"one", "d", "e1", 1}, {"two", "x", "e3", 2}, {"one", "d", "e2", 3}};
+    EXPECT_TRUE(Confirmations(stream).tell(several));
+    EXPECT_EQ(stream.entries["kesto.stored.one.d"].payload, R"({"epoch":"e2","id":3})");
+    EXPECT_EQ(stream.entries["kesto.stored.two.x"].payload, R"({"epoch":"e3","id":2})");
+    EXPECT_EQ(stream.puts, 2);
 }
 
 TEST(Confirmations, DoNotPassAFasterCopy)
 {
     RacingStream stream;
     stream.other = R"({"epoch":"e1","id":20})";
-    EXPECT_TRUE(Confirmations(stream).tell({"one", "d", "e1", 10}));
+    Confirmations confirmations(stream);
+    EXPECT_TRUE(tell(confirmations, "e1", 10));
     EXPECT_EQ(stream.entries["kesto.stored.one.d"].payload, R"({"epoch":"e1","id":20})");
 }
 

@@ -4,6 +4,7 @@
 #include "tools/kesto-ingest/FleetServers.h"
 #include "tools/kesto-ingest/stream/FakeStream.h"
 
+#include <fmt/format.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
@@ -110,19 +111,42 @@ TEST_P(StreamContract, GivesBatchesInTheirOrderUntilTheyAreAcknowledged)
 TEST_P(StreamContract, PutsAMessageOnlyAfterTheOneThatIsThere)
 {
     for (const std::string subject : {"kesto.owner.d", "kesto.stored.device-1.d"}) {
-        EXPECT_EQ(stream.last(subject).value(), std::nullopt);
-        const auto first = stream.put(subject, "one", 0).value();
+        const auto put = [&](const std::string& payload, std::uint64_t after) {
+            const Put asked{.subject = subject, .payload = payload, .after = after};
+            return stream.put({&asked, 1}).value().at(0);
+        };
+        EXPECT_FALSE(stream.last(subject).value());
+        const auto first = put("one", 0);
         ASSERT_TRUE(first);
-        EXPECT_EQ(stream.put(subject, "two", 0).value(), std::nullopt);
-        auto last = stream.last(subject).value();
+        EXPECT_EQ(put("two", 0), std::nullopt);
+        const auto last = stream.last(subject).value();
         ASSERT_TRUE(last);
         EXPECT_EQ(last->payload, "one");
         EXPECT_EQ(last->sequence, *first);
-        EXPECT_EQ(stream.put(subject, "two", *first + 1000).value(), std::nullopt);
-        const auto second = stream.put(subject, "two", *first).value();
-        ASSERT_TRUE(second);
+        EXPECT_EQ(put("two", *first + 1000), std::nullopt);
+        EXPECT_TRUE(put("two", *first));
         EXPECT_EQ(stream.last(subject).value()->payload, "two");
     }
+}
+
+TEST_P(StreamContract, PutsManyMessages)
+{
+    std::vector<Put> puts;
+    for (int place = 0; place < 600; ++place)
+        puts.push_back({.subject = fmt::format("kesto.owner.{}", place), .payload = fmt::format("{}", place)});
+    const auto answers = stream.put(puts);
+    ASSERT_TRUE(answers) << answers.error();
+    ASSERT_THAT(*answers, SizeIs(600));
+    for (const std::size_t place : {0U, 255U, 256U, 599U}) {
+        const auto last = stream.last(puts[place].subject).value();
+        ASSERT_TRUE(last);
+        EXPECT_EQ(last->payload, std::to_string(place));
+        EXPECT_EQ(last->sequence, (*answers)[place]);
+    }
+    puts.resize(2);
+    puts[1] = {.subject = "kesto.owner.new", .payload = "new"};
+    EXPECT_EQ(stream.put(puts).value().at(0), std::nullopt);
+    EXPECT_TRUE(stream.last("kesto.owner.new").value()) << "one that is overtaken does not stop the others";
 }
 
 TEST_P(StreamContract, PublishesWithHeaders)
