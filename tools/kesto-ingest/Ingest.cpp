@@ -186,6 +186,7 @@ std::expected<void, std::string> Ingest::putAside(Held& held)
     if (held.isPutAside)
         return {};
     std::vector<DeadRow> dead;
+    dead.reserve(held.badRows.size());
     for (const BadRow& row : held.badRows)
         dead.push_back({row.reason, row.line});
     auto put = held.refusal.empty() ? putRowsAside(stream_, held.delivery, dead)
@@ -197,6 +198,7 @@ std::expected<void, std::string> Ingest::putAside(Held& held)
 std::expected<void, std::string> Ingest::tellDevices()
 {
     std::vector<Confirmation> confirmations;
+    confirmations.reserve(held_.size());
     for (const Held& held : held_)
         if (held.refusal.empty())
             confirmations.push_back(held.confirmation);

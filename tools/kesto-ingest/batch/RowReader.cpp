@@ -3,6 +3,8 @@
 // spaces.
 #include "kesto-ingest/batch/RowReader.h"
 
+#include "foundation/values/String.h"
+
 #include <fmt/format.h>
 #include <rapidjson/error/en.h>
 #include <rapidjson/memorystream.h>
@@ -159,9 +161,10 @@ std::string_view lacking(const RowEntry& entry, FieldType type)
 
 std::expected<void, std::string> RowReader::parse(std::string_view line)
 {
-    constexpr unsigned flags =
-        rapidjson::kParseNumbersAsStringsFlag | rapidjson::kParseValidateEncodingFlag | rapidjson::kParseIterativeFlag;
+    constexpr unsigned flags = rapidjson::kParseNumbersAsStringsFlag | rapidjson::kParseIterativeFlag;
     size_ = 0;
+    if (!foundation::isValidUtf8(line)) // quicker than RapidJSON's own check of each text
+        return std::unexpected("it is no UTF-8");
     EntryHandler handler(entries_, size_);
     rapidjson::Reader reader;
     rapidjson::MemoryStream stream(line.data(), line.size());

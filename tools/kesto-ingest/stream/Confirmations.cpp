@@ -57,6 +57,7 @@ std::expected<void, std::string> Confirmations::leaveOutWhatIsTold(Waiting& wait
 std::expected<void, std::string> Confirmations::put(Waiting& waiting)
 {
     std::vector<Put> puts;
+    puts.reserve(waiting.size());
     for (const auto& [subject, confirmation] : waiting)
         puts.push_back({.subject = subject,
                         .payload = fmt::format(R"({{"epoch":"{}","id":{}}})", confirmation->epoch, confirmation->id),

@@ -143,6 +143,7 @@ JetStream::JetStream(const JetStreamConfiguration& configuration) : connection_(
     natsStatus status = natsOptions_Create(&made);
     const OwnedOptions options(made);
     std::vector<const char*> servers;
+    servers.reserve(configuration.servers.size());
     for (const std::string& server : configuration.servers)
         servers.push_back(server.c_str());
     const auto set = [&status](auto function, auto... arguments) {
@@ -261,6 +262,7 @@ std::expected<std::vector<Delivery>, std::string> JetStream::fetch(std::size_t m
         return std::unexpected(connection_->reason("no batches come", status));
     }
     std::vector<Delivery> deliveries;
+    deliveries.reserve(static_cast<std::size_t>(list.Count));
     for (int place = 0; place < list.Count; ++place) {
         natsMsg* const message = std::exchange(list.Msgs[place], nullptr);
         Delivery& delivery = deliveries.emplace_back();

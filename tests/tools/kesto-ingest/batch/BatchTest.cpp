@@ -128,7 +128,8 @@ TEST(Batch, NamesWhatIsWrongWithARow)
     EXPECT_EQ(reasonOf(std::string(deviceLine(1, 9), 0, deviceLine(1, 9).size() - 1)),
               "only the first row is of kind device");
     EXPECT_EQ(reasonOf(std::string("{\"kind\":\"event\"}\0x", 18)), "it is no JSON: it has a NUL");
-    EXPECT_THAT(reasonOf(eventWith("\xff", "player")), HasSubstr("Invalid encoding in string"));
+    EXPECT_EQ(reasonOf(eventWith("\xff", "player")), "it is no UTF-8");
+    EXPECT_THAT(reasonOf(eventWith(R"(\ud800)", "player")), HasSubstr("surrogate"));
     EXPECT_EQ(reasonOf(R"({"kind":"event","payload":)" + std::string(16, '[')),
               "its objects and lists are nested deeper than 16");
 }
