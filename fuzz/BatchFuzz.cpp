@@ -1,0 +1,46 @@
+// SPDX-License-Identifier: Apache-2.0
+// Batches come from devices that others hold in their hands. For all bytes, as a compressed batch and as its lines,
+// reading must end with a reason or with rows; and what becomes a row of the database must be one line of JSON of its
+// own.
+#include "kesto-ingest/batch/Batch.h"
+
+#include <rapidjson/document.h>
+
+#include <cstdint>
+#include <cstdlib>
+#include <string_view>
+
+namespace {
+
+void require(bool holds)
+{
+    if (!holds)
+        std::abort();
+}
+
+void check(const std::expected<kesto_ingest::Batch, std::string>& batch)
+{
+    if (!batch) {
+        require(!batch.error().empty());
+        return;
+    }
+    require(batch->device.size() == 32 && batch->epoch.size() == 32 && !batch->rows.empty());
+    for (const kesto_ingest::Row& row : batch->rows) {
+        require(row.json.find('\n') == row.json.size() - 1);
+        rapidjson::Document document;
+        document.Parse<rapidjson::kParseValidateEncodingFlag>(row.json.data(), row.json.size());
+        require(document.IsObject() && document.HasMember("device") && document["device"].GetString() == batch->device);
+    }
+    for (const kesto_ingest::BadRow& row : batch->badRows)
+        require(!row.reason.empty());
+}
+
+} // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size)
+{
+    const std::string_view bytes(reinterpret_cast<const char*>(data), size);
+    check(kesto_ingest::readBatch(bytes));
+    check(kesto_ingest::readLines(bytes));
+    return 0;
+}

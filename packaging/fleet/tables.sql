@@ -1,0 +1,83 @@
+-- The tables of a fleet, edition 1. Rows may be there more than once until the database has merged
+-- them: group by device, epoch and id, or read with FINAL.
+
+CREATE DATABASE IF NOT EXISTS kesto;
+
+-- what each device has sent
+CREATE TABLE IF NOT EXISTS kesto.batches (
+    device FixedString(32), -- the pseudonym
+    epoch FixedString(32), -- of the device's store: IDs mean something only with it
+    first_id UInt64, -- the IDs that the batch tells of, as far as they may leave
+    last_id UInt64,
+    sent Float64, -- by the device's clock
+    model String, -- of the device
+    version String, -- the device's release
+    received DateTime DEFAULT now() -- when it was stored here
+) ENGINE = ReplacingMergeTree()
+PARTITION BY toMonday(toDateTime(toUInt32(sent)))
+ORDER BY (device, epoch, last_id, first_id);
+
+-- what messages told
+CREATE TABLE IF NOT EXISTS kesto.events (
+    device FixedString(32), -- the pseudonym
+    epoch FixedString(32), -- of the device's store: IDs mean something only with it
+    id UInt64,
+    time Float64, -- when it was sent, by the device's clock
+    happened Nullable(Float64), -- when it happened, if told
+    name String,
+    session UInt64, -- an ID in sessions, or 0: it belongs to none
+    application String, -- empty: not known
+    model String, -- of the device
+    version String, -- the device's release
+    payload String, -- JSON without spaces
+    audio_device String DEFAULT visitParamExtractString(payload, 'active_devices'),
+    late_cycles Float64 DEFAULT visitParamExtractFloat(payload, 'late_cycles'),
+    received DateTime DEFAULT now() -- when it was stored here
+) ENGINE = ReplacingMergeTree()
+PARTITION BY toMonday(toDateTime(toUInt32(time)))
+ORDER BY (device, epoch, id);
+
+-- who played or recorded for how long
+CREATE TABLE IF NOT EXISTS kesto.stretches (
+    device FixedString(32), -- the pseudonym
+    epoch FixedString(32), -- of the device's store: IDs mean something only with it
+    id UInt64,
+    recording UInt8, -- 0: it played
+    began Float64,
+    seconds Float64,
+    played_seconds Float64 DEFAULT if(recording, 0, seconds),
+    session UInt64, -- an ID in sessions, or 0: it belongs to none
+    application String, -- empty: not known
+    audio_device String, -- empty: not known, as in the next
+    format String,
+    channels Nullable(UInt32),
+    volume Nullable(Float64),
+    ending String,
+    model String, -- of the device
+    version String, -- the device's release
+    received DateTime DEFAULT now() -- when it was stored here
+) ENGINE = ReplacingMergeTree()
+PARTITION BY toMonday(toDateTime(toUInt32(began)))
+ORDER BY (device, epoch, id);
+
+-- of the devices' clients
+CREATE TABLE IF NOT EXISTS kesto.sessions (
+    device FixedString(32), -- the pseudonym
+    epoch FixedString(32), -- of the device's store: IDs mean something only with it
+    id UInt64,
+    began Float64,
+    ended Nullable(Float64),
+    has_ended UInt8 DEFAULT isNotNull(ended), -- the row that says so stays
+    reporter Int64,
+    service String,
+    application String, -- empty: not known
+    process String,
+    model String, -- of the device
+    version String, -- the device's release
+    received DateTime DEFAULT now() -- when it was stored here
+) ENGINE = ReplacingMergeTree(has_ended)
+PARTITION BY toMonday(toDateTime(toUInt32(began)))
+ORDER BY (device, epoch, id);
+
+-- A view, so that each server of a cluster has it.
+CREATE VIEW IF NOT EXISTS kesto.edition AS SELECT toUInt64(1) AS edition;

@@ -1,0 +1,294 @@
+// SPDX-License-Identifier: Apache-2.0
+// The whole: a real nats-server, a real ClickHouse, the program as it is shipped, and batches made by hand.
+//
+// Each test ends with the equation that counts: each row that a device may send is in the database, once by its key.
+#include "kesto-ingest/stream/JetStream.h"
+#include "tools/kesto-ingest/Batches.h"
+#include "tools/kesto-ingest/FleetServers.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+#include <arpa/inet.h>
+#include <netinet/in.h>
+#include <poll.h>
+#include <sys/socket.h>
+
+#include <array>
+#include <atomic>
+#include <csignal>
+#include <thread>
+
+namespace kesto_ingest {
+namespace {
+
+using testing::HasSubstr;
+
+// Stands between the program and the database, and can keep the database's answers to itself.
+class Relay {
+public:
+    explicit Relay(std::uint16_t upstream) : upstream_(upstream)
+    {
+        const int on = 1;
+        ::setsockopt(listener_.get(), SOL_SOCKET, SO_REUSEADDR, &on, sizeof on);
+        const sockaddr_in address = addressOf(port_);
+        EXPECT_EQ(::bind(listener_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
+        EXPECT_EQ(::listen(listener_.get(), 8), 0);
+        thread_ = std::thread([this] { run(); });
+    }
+    ~Relay()
+    {
+        shallEnd_ = true;
+        thread_.join();
+    }
+    Relay(const Relay&) = delete;
+    Relay& operator=(const Relay&) = delete;
+
+    [[nodiscard]] std::string address() const { return "http://127.0.0.1:" + std::to_string(port_); }
+    void keepAnswers() { keepsAnswers_ = true; }
+    [[nodiscard]] bool hasKeptAnAnswer() const { return hasKept_; }
+
+private:
+    using Descriptor = platform::FileDescriptor;
+
+    static sockaddr_in addressOf(std::uint16_t port)
+    {
+        sockaddr_in address{};
+        address.sin_family = AF_INET;
+        address.sin_port = htons(port);
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        return address;
+    }
+    static Descriptor makeSocket() { return Descriptor(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)); }
+
+    // One connection at a time: the program has one.
+    void run()
+    {
+        while (!shallEnd_) {
+            pollfd awaited{listener_.get(), POLLIN, 0};
+            if (::poll(&awaited, 1, step) != 1)
+                continue;
+            const Descriptor client(::accept(listener_.get(), nullptr, nullptr));
+            const Descriptor server = makeSocket();
+            const sockaddr_in address = addressOf(upstream_);
+            if (::connect(server.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0)
+                relay(client.get(), server.get());
+        }
+    }
+    void relay(int client, int server)
+    {
+        std::array<char, 65536> bytes;
+        while (!shallEnd_) {
+            std::array<pollfd, 2> awaited{{{client, POLLIN, 0}, {server, POLLIN, 0}}};
+            ::poll(awaited.data(), awaited.size(), step);
+            for (const bool isAnswer : {false, true}) {
+                if (awaited[isAnswer ? 1 : 0].revents == 0)
+                    continue;
+                const ssize_t count = ::recv(isAnswer ? server : client, bytes.data(), bytes.size(), 0);
+                if (count <= 0)
+                    return;
+                if (isAnswer && keepsAnswers_)
+                    hasKept_ = true;
+                else
+                    static_cast<void>(::send(isAnswer ? client : server, bytes.data(), static_cast<std::size_t>(count),
+                                             MSG_NOSIGNAL));
+            }
+        }
+    }
+
+    static constexpr int step = 20; // milliseconds
+
+    const std::uint16_t upstream_;
+    const std::uint16_t port_ = freePort();
+    const Descriptor listener_ = makeSocket();
+    std::atomic<bool> keepsAnswers_ = false;
+    std::atomic<bool> hasKept_ = false;
+    std::atomic<bool> shallEnd_ = false;
+    std::thread thread_;
+};
+
+class IngestEndToEnd : public testing::Test {
+protected:
+    IngestEndToEnd()
+    {
+        database.makeTables();
+        for (const std::string name : {"admin", "ingest"}) {
+            support::writeFile(directory / (name + ".secret"),
+                               fmt::format("user = \"{0}\"\npassword = \"{0}\"\n", name));
+            std::filesystem::permissions(directory / (name + ".secret"), std::filesystem::perms(0600));
+        }
+        const auto made =
+            sdk_test::run({KESTO_INGEST, "setup", "--configuration", configuration("admin", database.address()),
+                           "--gigabytes", "0.1", "--dead-gigabytes", "0.1", "--redeliver-seconds", "2"});
+        EXPECT_EQ(made.status, 0) << made.errors;
+        device1 = std::make_unique<JetStream>(as("device-1"));
+        device2 = std::make_unique<JetStream>(as("device-2"));
+        admin = std::make_unique<JetStream>(as("admin"));
+    }
+
+    [[nodiscard]] JetStreamConfiguration as(const std::string& name) const
+    {
+        return {.servers = {stream.address()},
+                .user = name,
+                .password = name,
+                .timeLimit = std::chrono::milliseconds{1000}};
+    }
+    [[nodiscard]] std::string configuration(const std::string& name, const std::string& databaseAddress)
+    {
+        std::string file = directory / fmt::format("{}-{}.toml", name, ++files_);
+        support::writeFile(
+            file,
+            fmt::format("[stream]\nservers = [\"{}\"]\ncredentials = \"{}\"\n"
+                        "[database]\nservers = [\"{}\"]\n[batches]\nseconds = 0.1\n[metrics]\nport = {}\n",
+                        stream.address(), (directory / (name + ".secret")).native(), databaseAddress, metricsPort));
+        return file;
+    }
+    [[nodiscard]] std::unique_ptr<sdk_test::Process> start(const std::string& databaseAddress)
+    {
+        auto ingest = std::make_unique<sdk_test::Process>(sdk_test::Process::Arguments{
+            KESTO_INGEST, "run", "--configuration", configuration("ingest", databaseAddress)});
+        waitUntil("kesto-ingest is ready", [&] { return ingest->errors().contains("ready"); });
+        return ingest;
+    }
+    static void send(JetStream& device, const std::string& name, const std::string& text, const std::string& identity)
+    {
+        const auto sent = device.publish("kesto.events." + name, compressed(text),
+                                         {{"Kesto-Edition", "1"}, {"Nats-Msg-Id", identity}});
+        ASSERT_TRUE(sent) << sent.error();
+    }
+    void awaitStored(int id, std::string_view device = deviceA, const std::string& name = "device-1")
+    {
+        waitUntil(fmt::format("stored up to {} of {}", id, name), [&] {
+            const auto entry = admin->last(fmt::format("kesto.stored.{}.{}", name, device));
+            return entry && *entry && (*entry)->payload == fmt::format(R"({{"epoch":"{}","id":{}}})", epochA, id);
+        });
+    }
+    [[nodiscard]] std::string metrics() const { return ask(fmt::format("http://127.0.0.1:{}/metrics", metricsPort)); }
+    [[nodiscard]] std::string letter(const std::string& name)
+    {
+        const auto entry = admin->last("kesto.dead." + name);
+        return entry && *entry ? (*entry)->payload : "";
+    }
+    // The IDs that are stored, each once.
+    [[nodiscard]] std::string events(std::string_view device = deviceA)
+    {
+        return database.select(fmt::format("SELECT arrayStringConcat(arrayMap(x -> toString(x), "
+                                           "arraySort(groupUniqArray(id))), ' ') FROM events WHERE "
+                                           "device = '{}'",
+                                           device));
+    }
+    void expectEnd(sdk_test::Process& ingest)
+    {
+        ingest.signal(SIGTERM);
+        EXPECT_EQ(ingest.wait(), 0) << ingest.errors();
+    }
+
+    support::TemporaryDirectory directory;
+    NatsServer stream{directory / "nats"};
+    ClickHouseServer database{directory / "clickhouse"};
+    std::uint16_t metricsPort = freePort();
+    std::unique_ptr<JetStream> device1;
+    std::unique_ptr<JetStream> device2;
+    std::unique_ptr<JetStream> admin;
+
+private:
+    int files_ = 0;
+};
+
+TEST_F(IngestEndToEnd, StoresWhatIsRightAndPutsAsideWhatIsWrong)
+{
+    const auto ingest = start(database.address());
+    send(*device1, "device-1", deviceLine(1, 3) + eventLine(1) + "nonsense\n" + eventLine(2) + stretchLine(3), "1");
+    awaitStored(3);
+    EXPECT_EQ(events(), "1 2");
+    EXPECT_EQ(letter("device-1"),
+              "{\"reason\":\"it is no JSON from byte 1 on: Invalid value.\",\"row\":\"nonsense\"}\n");
+
+    // The same once more: the stream knows the message; and, as after its window, under another identity.
+    send(*device1, "device-1", deviceLine(1, 3) + eventLine(1) + eventLine(2) + stretchLine(3), "1");
+    send(*device1, "device-1", deviceLine(1, 3) + eventLine(1) + eventLine(2) + stretchLine(3), "1 again");
+    send(*device1, "device-1", deviceLine(4, 4) + eventLine(4), "4");
+    awaitStored(4);
+    EXPECT_EQ(events(), "1 2 4");
+    EXPECT_EQ(database.select("SELECT count() FROM events FINAL"), "3");
+    EXPECT_EQ(database.select("SELECT count() FROM stretches FINAL"), "1");
+
+    // The pseudonym of another, and the subject of another.
+    send(*device2, "device-2", deviceLine(5, 5) + eventLine(5), "5");
+    send(*device2, "device-2", deviceLine(1, 1, deviceB) + eventLine(1, deviceB), "6");
+    awaitStored(1, deviceB, "device-2");
+    EXPECT_EQ(events(), "1 2 4");
+    EXPECT_EQ(events(deviceB), "1");
+    EXPECT_EQ(letter("device-2"), compressed(deviceLine(5, 5) + eventLine(5)));
+    EXPECT_THAT(ingest->errors(), HasSubstr("belongs to the credential device-1"));
+    const auto forbidden = device2->publish("kesto.events.device-1", "x", {});
+    ASSERT_FALSE(forbidden);
+    EXPECT_THAT(forbidden.error(), HasSubstr("Permissions Violation for Publish to \"kesto.events.device-1\""));
+
+    // A batch that cannot be read.
+    ASSERT_TRUE(device1->publish("kesto.events.device-1", "rubbish", {{"Kesto-Edition", "1"}}));
+    waitUntil("the batch is put aside", [&] { return letter("device-1") == "rubbish"; });
+    const std::string text = metrics();
+    EXPECT_THAT(text, HasSubstr("kesto_ingest_batches_refused_total{reason=\"forged\"} 1\n"));
+    EXPECT_THAT(text, HasSubstr("kesto_ingest_batches_refused_total{reason=\"unreadable\"} 1\n"));
+    EXPECT_THAT(text, HasSubstr("kesto_ingest_rows_refused_total{reason=\"schema\"} 1\n"));
+    EXPECT_THAT(text, HasSubstr("kesto_ingest_batches_stored_total 4\n"));
+    expectEnd(*ingest);
+}
+
+TEST_F(IngestEndToEnd, LosesNothingIfItIsKilledBetweenInsertAndAcknowledgement)
+{
+    Relay relay(database.port());
+    auto ingest = start(relay.address());
+    relay.keepAnswers();
+    send(*device1, "device-1", deviceLine(1, 2) + eventLine(1) + eventLine(2), "1");
+    waitUntil("the database has answered", [&] { return relay.hasKeptAnAnswer(); });
+    EXPECT_EQ(database.select("SELECT count() FROM events"), "2") << "inserted, and not acknowledged";
+    ingest->signal(SIGKILL);
+    EXPECT_EQ(ingest->wait(), 128 + SIGKILL);
+
+    ingest = start(database.address());
+    awaitStored(2);
+    EXPECT_EQ(events(), "1 2");
+    EXPECT_EQ(database.select("SELECT count() FROM events FINAL"), "2");
+    EXPECT_EQ(database.select("SELECT count() FROM batches FINAL"), "1");
+    EXPECT_THAT(metrics(), HasSubstr("kesto_ingest_batches_repeated_total 1\n"));
+    expectEnd(*ingest);
+}
+
+TEST_F(IngestEndToEnd, WaitsForADatabaseThatIsAway)
+{
+    auto ingest = start(database.address());
+    database.end();
+    send(*device1, "device-1", deviceLine(1, 2) + eventLine(1) + eventLine(2), "1");
+    waitUntil("it notices", [&] { return metrics().contains("kesto_ingest_database_up 0\n"); });
+    EXPECT_THAT(ingest->errors(), HasSubstr("Failed to connect"));
+
+    // One copy ends meanwhile: the next has the batch without waiting for the end of its time.
+    expectEnd(*ingest);
+    database.start();
+    ingest = start(database.address());
+    awaitStored(2);
+    EXPECT_EQ(events(), "1 2");
+    expectEnd(*ingest);
+}
+
+TEST_F(IngestEndToEnd, SaysWhatIsMissing)
+{
+    EXPECT_EQ(database.select("DROP TABLE edition"), "");
+    const std::string file = configuration("ingest", database.address());
+    auto ended = sdk_test::run({KESTO_INGEST, "run", "--configuration", file});
+    EXPECT_EQ(ended.status, 78);
+    EXPECT_EQ(ended.errors,
+              "kesto-ingest: the database kesto has no tables: make them by "
+              "`kesto-ingest tables | clickhouse-client --multiquery`\n");
+    EXPECT_EQ(database.select("CREATE VIEW edition AS SELECT toUInt64(7) AS edition"), "");
+    ended = sdk_test::run({KESTO_INGEST, "run", "--configuration", file});
+    EXPECT_EQ(ended.status, 78);
+    EXPECT_EQ(ended.errors,
+              "kesto-ingest: the tables in the database kesto are of edition 7, and this program writes "
+              "edition 1: update the older of the two\n");
+}
+
+} // namespace
+} // namespace kesto_ingest

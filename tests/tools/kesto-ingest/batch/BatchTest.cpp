@@ -1,0 +1,192 @@
+// SPDX-License-Identifier: Apache-2.0
+// What a batch may hold, and what becomes of a row.
+#include "kesto-ingest/batch/Batch.h"
+
+#include "kesto-ingest/batch/Compression.h"
+#include "tools/kesto-ingest/Batches.h"
+
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace kesto_ingest {
+namespace {
+
+using testing::HasSubstr;
+using testing::IsEmpty;
+using testing::SizeIs;
+
+Batch batchOf(const std::string& lines)
+{
+    auto batch = readLines(lines);
+    EXPECT_TRUE(batch) << batch.error();
+    return batch.value_or(Batch());
+}
+
+// Why this row is refused behind a good first one; empty if it is not.
+std::string reasonOf(const std::string& line)
+{
+    const Batch batch = batchOf(deviceLine(1, 9) + line + "\n");
+    if (batch.badRows.empty())
+        return "";
+    EXPECT_EQ(batch.badRows[0].line, line);
+    return batch.badRows[0].reason;
+}
+
+// An event with this in the place of a key and its value.
+std::string eventWith(std::string_view instead, std::string_view of)
+{
+    std::string line = eventLine(5);
+    line.pop_back();
+    const std::size_t place = line.find(of);
+    EXPECT_NE(place, std::string::npos) << of;
+    return line.replace(place, of.size(), instead);
+}
+
+TEST(Batch, TellsWhoseItIs)
+{
+    const Batch batch = batchOf(deviceLine(3, 9));
+    EXPECT_EQ(batch.device, "0123456789abcdef0123456789abcdef");
+    EXPECT_EQ(batch.epoch, "00000000000000000000000000000001");
+    EXPECT_EQ(batch.last, 9U);
+    EXPECT_THAT(batch.badRows, IsEmpty());
+}
+
+TEST(Batch, BecomesRowsWithTheColumnsOfTheirTables)
+{
+    const Batch batch = batchOf(deviceLine(3, 9) + eventLine(3) + stretchLine(4) + sessionLine(7, "1795264600.125"));
+    ASSERT_THAT(batch.rows, SizeIs(4));
+    EXPECT_EQ(batch.rows[0].table, Table::Batches);
+    EXPECT_EQ(
+        batch.rows[0].json,
+        R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","model":"lamp",)"
+        R"("version":"1.2","sent":1795264600.5,"first_id":3,"last_id":9})"
+        "\n");
+    EXPECT_EQ(batch.rows[1].table, Table::Events);
+    EXPECT_EQ(batch.rows[1].json,
+              R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":3,)"
+              R"("time":1795264505.66,"name":"com.quarn.kesto.Error.IssueDetector","payload":"{\"late_cycles\":3}",)"
+              R"("session":7,"application":"player","model":"lamp","version":"1.2"})"
+              "\n");
+    EXPECT_EQ(batch.rows[2].table, Table::Stretches);
+    EXPECT_EQ(batch.rows[2].json,
+              R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":4,)"
+              R"("recording":0,"began":1795264500.25,"seconds":12.5,"session":7,"audio_device":"headset","channels":2,)"
+              R"("volume":0.5,"application":"player","ending":"stopped","model":"lamp","version":"1.2"})"
+              "\n");
+    EXPECT_EQ(batch.rows[3].table, Table::Sessions);
+    EXPECT_EQ(batch.rows[3].json,
+              R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":7,)"
+              R"("reporter":-5,"application":"player","began":1795264400,"ended":1795264600.125,"model":"lamp",)"
+              R"("version":"1.2"})"
+              "\n");
+    EXPECT_EQ(batch.rows[1].week, 2968U); // 1795264505 s are 2968.3 weeks
+}
+
+TEST(Batch, KeepsPayloadsAsTheyAre)
+{
+    const std::string payload = R"({ "a": [1.10, 1e2, -0, 0.30000000000000004, true, null, {"b": "\u00e9\n\""}] })";
+    const Batch batch = batchOf(deviceLine(1, 9) + eventLine(5, deviceA, payload));
+    ASSERT_THAT(batch.rows, SizeIs(2));
+    EXPECT_THAT(batch.rows[1].json,
+                HasSubstr(R"("payload":"{\"a\":[1.10,1e2,-0,0.30000000000000004,true,null,{\"b\":\"é\\n\\\"\"}]}")"));
+}
+
+TEST(Batch, PutsAsideWrongRowsOnly)
+{
+    const Batch batch = batchOf(deviceLine(1, 9) + "nonsense\n" + eventLine(5) + "\n" + eventLine(6, deviceB));
+    EXPECT_THAT(batch.rows, SizeIs(2));
+    ASSERT_THAT(batch.badRows, SizeIs(2));
+    EXPECT_EQ(batch.badRows[0].reason, "it is no JSON from byte 1 on: Invalid value.");
+    EXPECT_EQ(batch.badRows[1].reason, "the first row is of another device or epoch");
+}
+
+TEST(Batch, NamesWhatIsWrongWithARow)
+{
+    EXPECT_EQ(reasonOf("[]"), "it is no JSON object");
+    EXPECT_EQ(reasonOf("7"), "it is no JSON object");
+    EXPECT_EQ(reasonOf("{}"), "it has no kind");
+    EXPECT_EQ(reasonOf(R"({"kind":"noise"})"), "there are no rows of kind noise");
+    EXPECT_EQ(reasonOf(R"({"kind":"event","kind":"event"})"), "the key kind is there twice");
+    EXPECT_EQ(reasonOf(eventWith(R"("colour":7)", R"("session":7)")), "a row of kind event has no key colour");
+    EXPECT_EQ(reasonOf(eventWith(R"("session":7,)", R"("id":5,)")), "the key session is there twice");
+    EXPECT_EQ(reasonOf(eventWith("", R"("id":5,)")), "the key id is missing");
+    EXPECT_EQ(reasonOf(eventWith(R"("id":5.5,)", R"("id":5,)")), "id is not an integer from 0 to 2^63 - 1");
+    EXPECT_EQ(reasonOf(eventWith(R"("id":-5,)", R"("id":5,)")), "id is not an integer from 0 to 2^63 - 1");
+    EXPECT_EQ(reasonOf(eventWith(R"("id":9223372036854775808,)", R"("id":5,)")),
+              "id is not an integer from 0 to 2^63 - 1");
+    EXPECT_EQ(reasonOf(eventWith(R"("time":-1)", R"("time":1795264505.66)")),
+              "time is not a number of seconds from 0 to 2^32 - 1");
+    EXPECT_EQ(reasonOf(eventWith(R"("time":"1")", R"("time":1795264505.66)")),
+              "time is not a number of seconds from 0 to 2^32 - 1");
+    EXPECT_EQ(reasonOf(eventWith(R"("payload":[])", R"("payload":{"late_cycles":3})")), "payload is not an object");
+    EXPECT_EQ(reasonOf(eventWith(R"("happened":"1","id":5,)", R"("id":5,)")), "happened is not a number");
+    EXPECT_THAT(reasonOf(eventWith(R"("happened":1e400,"id":5,)", R"("id":5,)")), HasSubstr("Number too big"));
+    EXPECT_EQ(reasonOf(eventWith("0123456789ABCDEF", "0123456789abcdef")),
+              "device is not 32 hexadecimal digits, in lower case");
+    EXPECT_EQ(reasonOf(eventWith(std::string(16 * 1024 + 1, 'x'), "player")),
+              "application is not a text of at most 16384 bytes");
+    EXPECT_EQ(reasonOf(std::string(deviceLine(1, 9), 0, deviceLine(1, 9).size() - 1)),
+              "only the first row is of kind device");
+    EXPECT_EQ(reasonOf(std::string("{\"kind\":\"event\"}\0x", 18)), "it is no JSON: it has a NUL");
+    EXPECT_EQ(reasonOf(eventWith("\xff", "player")), "it is no UTF-8");
+    EXPECT_THAT(reasonOf(eventWith(R"(\ud800)", "player")), HasSubstr("surrogate"));
+    EXPECT_EQ(reasonOf(R"({"kind":"event","payload":)" + std::string(16, '[')),
+              "its objects and lists are nested deeper than 16");
+}
+
+TEST(Batch, TakesWhatIsAllowed)
+{
+    EXPECT_EQ(reasonOf(eventWith(R"("happened":-1e300,"id":9223372036854775807,)", R"("id":5,)")), "");
+    EXPECT_EQ(reasonOf(eventWith(R"("session":null)", R"("session":7)")), "");
+    EXPECT_EQ(reasonOf(eventWith(R"("time":4294967295)", R"("time":1795264505.66)")), "");
+    EXPECT_EQ(reasonOf(eventWith(std::string(16 * 1024, 'x'), "player")), "");
+}
+
+TEST(Batch, IsRefusedWithoutAGoodFirstRow)
+{
+    EXPECT_EQ(readLines("").error(), "it is empty");
+    EXPECT_EQ(readLines("\n\n").error(), "it is empty");
+    EXPECT_EQ(readLines(eventLine(1)).error(), "its first row is not of kind device");
+    EXPECT_EQ(readLines("{}\n").error(), "its first row is wrong: it has no kind");
+    EXPECT_EQ(readLines(deviceLine(5, 4)).error(), "its first row names a range that ends before it begins");
+}
+
+TEST(Compression, GivesBackTheContent)
+{
+    EXPECT_EQ(decompress(compressed("content"), 7), "content");
+    EXPECT_EQ(decompress(compressed(""), 7), "");
+}
+
+TEST(Compression, RefusesWhatIsNotOneWholeFrameWithinTheBound)
+{
+    const std::string frame = compressed(std::string(1000, 'x'));
+    EXPECT_EQ(decompress(frame, 999).error(), "it has 1000 bytes; 999 are the most");
+    EXPECT_EQ(decompress("nonsense", 999).error(), "it is not compressed with zstd");
+    EXPECT_EQ(decompress("", 999).error(), "it is not compressed with zstd");
+    EXPECT_EQ(decompress(frame + frame, 1000).error(), "it is not one whole frame of zstd");
+    EXPECT_EQ(decompress(frame.substr(0, frame.size() - 1), 1000).error(), "it is not one whole frame of zstd");
+    std::string damaged = frame;
+    damaged.back() = static_cast<char>(damaged.back() ^ 0x7f);
+    EXPECT_FALSE(decompress(damaged, 1000));
+}
+
+TEST(Compression, RefusesFramesThatDoNotTellTheirSize)
+{
+    const std::unique_ptr<ZSTD_CCtx, decltype(&ZSTD_freeCCtx)> context(ZSTD_createCCtx(), ZSTD_freeCCtx);
+    ZSTD_CCtx_setParameter(context.get(), ZSTD_c_contentSizeFlag, 0);
+    std::string bytes(100, '\0');
+    bytes.resize(ZSTD_compress2(context.get(), bytes.data(), bytes.size(), "content", 7));
+    EXPECT_EQ(decompress(bytes, 999).error(), "its frame does not tell the size of the content");
+}
+
+TEST(Batch, IsRefusedIfItIsTooLarge)
+{
+    EXPECT_EQ(readBatch(std::string(512 * 1024 + 1, 'x')).error(),
+              "it has 524289 compressed bytes; 524288 are the most");
+    EXPECT_EQ(readBatch(compressed(std::string(8 * 1024 * 1024 + 1, '\n'))).error(),
+              "it has 8388609 bytes; 8388608 are the most");
+    EXPECT_EQ(readBatch(compressed(deviceLine(1, 9)))->last, 9U);
+}
+
+} // namespace
+} // namespace kesto_ingest

@@ -1,0 +1,161 @@
+// SPDX-License-Identifier: Apache-2.0
+// What the program relies on of the stream holds for the one in memory and for JetStream.
+#include "kesto-ingest/stream/JetStream.h"
+#include "tools/kesto-ingest/FleetServers.h"
+#include "tools/kesto-ingest/stream/FakeStream.h"
+
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+#include <gtest/gtest.h>
+
+namespace kesto_ingest {
+namespace {
+
+using std::chrono::milliseconds;
+using testing::SizeIs;
+
+// A stream, and a device that sends.
+class StreamProvider {
+public:
+    StreamProvider() = default;
+    virtual ~StreamProvider() = default;
+    StreamProvider(const StreamProvider&) = delete;
+    StreamProvider& operator=(const StreamProvider&) = delete;
+    virtual Stream& stream() = 0;
+    virtual void send(const std::string& payload) = 0;
+};
+
+class FakeProvider : public StreamProvider {
+public:
+    Stream& stream() override { return stream_; }
+    void send(const std::string& payload) override { stream_.send("kesto.events.device-1", payload); }
+
+private:
+    FakeStream stream_;
+};
+
+class JetStreamProvider : public StreamProvider {
+public:
+    Stream& stream() override { return stream_; }
+    void send(const std::string& payload) override
+    {
+        const auto sent = device_.publish("kesto.events.device-1", payload, {{"Kesto-Edition", "1"}});
+        ASSERT_TRUE(sent) << sent.error();
+    }
+
+private:
+    [[nodiscard]] JetStreamConfiguration as(const std::string& name) const
+    {
+        return {.servers = {server_.address()}, .user = name, .password = name};
+    }
+    [[nodiscard]] bool setUp() const
+    {
+        JetStream admin(as("admin"));
+        return admin.setUp({.eventsBytes = 1 << 26, .deadBytes = 1 << 26}).has_value();
+    }
+
+    support::TemporaryDirectory directory_;
+    NatsServer server_{directory_ / "nats"};
+    bool isSetUp_ = setUp();
+    JetStream stream_{as("ingest")};
+    JetStream device_{as("device-1")};
+};
+
+std::unique_ptr<StreamProvider> makeProvider(const std::string& name)
+{
+    if (name == "Fake")
+        return std::make_unique<FakeProvider>();
+    return std::make_unique<JetStreamProvider>();
+}
+
+class StreamContract : public testing::TestWithParam<std::string> {
+protected:
+    // Waits for as many, since what is given back comes after a time.
+    [[nodiscard]] std::vector<Delivery> fetch(std::size_t count)
+    {
+        std::vector<Delivery> deliveries;
+        for (int attempt = 0; attempt < 20 && deliveries.size() < count; ++attempt) {
+            auto fetched = stream.fetch(count - deliveries.size(), milliseconds{500});
+            EXPECT_TRUE(fetched) << fetched.error();
+            std::ranges::move(fetched.value_or(std::vector<Delivery>()), std::back_inserter(deliveries));
+        }
+        return deliveries;
+    }
+
+    std::unique_ptr<StreamProvider> provider = makeProvider(GetParam());
+    Stream& stream = provider->stream();
+};
+
+TEST_P(StreamContract, GivesBatchesInTheirOrderUntilTheyAreAcknowledged)
+{
+    EXPECT_THAT(stream.fetch(5, milliseconds{50}).value(), SizeIs(0));
+    provider->send("one");
+    provider->send("two");
+    auto deliveries = fetch(2);
+    ASSERT_THAT(deliveries, SizeIs(2));
+    EXPECT_EQ(deliveries[0].payload, "one");
+    EXPECT_EQ(deliveries[0].subject, "kesto.events.device-1");
+    EXPECT_EQ(deliveries[0].edition, "1");
+    EXPECT_FALSE(deliveries[0].isRepeated);
+    EXPECT_EQ(deliveries[1].payload, "two");
+    EXPECT_GT(deliveries[1].sequence, deliveries[0].sequence);
+    stream.workGoesOn(deliveries[0]);
+    stream.acknowledge(deliveries[0]);
+    stream.giveBack(deliveries[1]);
+    deliveries = fetch(1);
+    ASSERT_THAT(deliveries, SizeIs(1));
+    EXPECT_EQ(deliveries[0].payload, "two");
+    EXPECT_TRUE(deliveries[0].isRepeated);
+}
+
+TEST_P(StreamContract, PutsAMessageOnlyAfterTheOneThatIsThere)
+{
+    for (const std::string subject : {"kesto.owner.d", "kesto.stored.device-1.d"}) {
+        const auto put = [&](const std::string& payload, std::uint64_t after) {
+            const Put asked{.subject = subject, .payload = payload, .after = after};
+            return stream.put({&asked, 1}).value().at(0);
+        };
+        EXPECT_FALSE(stream.last(subject).value());
+        const auto first = put("one", 0);
+        ASSERT_TRUE(first);
+        EXPECT_EQ(put("two", 0), std::nullopt);
+        const auto last = stream.last(subject).value();
+        ASSERT_TRUE(last);
+        EXPECT_EQ(last->payload, "one");
+        EXPECT_EQ(last->sequence, *first);
+        EXPECT_EQ(put("two", *first + 1000), std::nullopt);
+        EXPECT_TRUE(put("two", *first));
+        EXPECT_EQ(stream.last(subject).value()->payload, "two");
+    }
+}
+
+TEST_P(StreamContract, PutsManyMessages)
+{
+    std::vector<Put> puts;
+    for (int place = 0; place < 600; ++place)
+        puts.push_back({.subject = fmt::format("kesto.owner.{}", place), .payload = fmt::format("{}", place)});
+    const auto answers = stream.put(puts);
+    ASSERT_TRUE(answers) << answers.error();
+    ASSERT_THAT(*answers, SizeIs(600));
+    for (const std::size_t place : {0U, 255U, 256U, 599U}) {
+        const auto last = stream.last(puts[place].subject).value();
+        ASSERT_TRUE(last);
+        EXPECT_EQ(last->payload, std::to_string(place));
+        EXPECT_EQ(last->sequence, (*answers)[place]);
+    }
+    puts.resize(2);
+    puts[1] = {.subject = "kesto.owner.new", .payload = "new"};
+    EXPECT_EQ(stream.put(puts).value().at(0), std::nullopt);
+    EXPECT_TRUE(stream.last("kesto.owner.new").value()) << "one that is overtaken does not stop the others";
+}
+
+TEST_P(StreamContract, PublishesWithHeaders)
+{
+    EXPECT_TRUE(stream.publish("kesto.dead.device-1", "letter", {{"Nats-Msg-Id", "KESTO:1:0"}, {"Kesto-Reason", "r"}}));
+}
+
+INSTANTIATE_TEST_SUITE_P(Of, StreamContract, testing::Values("Fake", "JetStream"),
+                         [](const auto& provider) { return provider.param; });
+
+} // namespace
+} // namespace kesto_ingest

@@ -1,0 +1,153 @@
+// SPDX-License-Identifier: Apache-2.0
+// Cuts a batch into lines, and writes each good row with the columns of its table, and the device's model and version.
+#include "kesto-ingest/batch/Batch.h"
+
+#include "kesto-ingest/batch/Compression.h"
+#include "kesto-ingest/batch/RowReader.h"
+
+#include <charconv>
+#include <fmt/format.h>
+#include <iterator>
+
+namespace kesto_ingest {
+
+namespace {
+
+// Appends what needs no escape at once: that is nearly all.
+void appendText(std::string_view text, std::string& json)
+{
+    json += '"';
+    std::size_t appended = 0;
+    for (std::size_t place = 0; place < text.size(); ++place) {
+        const char character = text[place];
+        const bool isControl = static_cast<unsigned char>(character) < 0x20;
+        if (character != '"' && character != '\\' && !isControl)
+            continue;
+        json += text.substr(appended, place - appended);
+        appended = place + 1;
+        if (isControl)
+            fmt::format_to(std::back_inserter(json), "\\u{:04x}", static_cast<unsigned>(character));
+        else
+            (json += '\\') += character;
+    }
+    json += text.substr(appended);
+    json += '"';
+}
+
+void appendColumn(const Field& field, const RowReader& row, std::string& json)
+{
+    const RowEntry* const entry = row.find(field.key);
+    if (entry == nullptr || field.column.empty())
+        return;
+    json += json.empty() ? "{\"" : ",\"";
+    json += field.column;
+    json += "\":";
+    switch (field.type) {
+    case FieldType::Moment:
+    case FieldType::Number:
+    case FieldType::Length:
+    case FieldType::Identity:
+    case FieldType::Integer:
+    case FieldType::Count: json += entry->text; break;
+    case FieldType::Flag: json += entry->kind == ValueKind::True ? '1' : '0'; break;
+    case FieldType::Digits:
+    case FieldType::Text:
+    case FieldType::Object: appendText(entry->text, json); break;
+    }
+}
+
+// The lines after another, and what the first of them says of the device.
+class BatchReader {
+public:
+    std::expected<Batch, std::string> read(std::string_view lines)
+    {
+        while (!lines.empty()) {
+            const std::size_t end = lines.find('\n');
+            const std::string_view line = lines.substr(0, end);
+            lines.remove_prefix(end == std::string_view::npos ? lines.size() : end + 1);
+            if (line.empty())
+                continue;
+            if (!isBegun_) {
+                if (auto begun = begin(line); !begun)
+                    return std::unexpected(begun.error());
+            } else
+                add(line);
+        }
+        if (!isBegun_)
+            return std::unexpected("it is empty");
+        return std::move(batch_);
+    }
+
+private:
+    std::expected<void, std::string> begin(std::string_view line)
+    {
+        if (auto read = row_.read(line); !read)
+            return std::unexpected("its first row is wrong: " + read.error());
+        if (row_.kind().table != Table::Batches)
+            return std::unexpected("its first row is not of kind device");
+        batch_.device = row_.text("device");
+        batch_.epoch = row_.text("epoch");
+        batch_.last = row_.identity("last");
+        if (row_.identity("first") > batch_.last)
+            return std::unexpected("its first row names a range that ends before it begins");
+        for (const std::string_view label : {"model", "version"})
+            if (const std::string_view text = row_.text(label); !text.empty()) {
+                labels_ += fmt::format(",\"{}\":", label);
+                appendText(text, labels_);
+            }
+        isBegun_ = true;
+        addRow("");
+        return {};
+    }
+
+    void add(std::string_view line)
+    {
+        if (auto read = row_.read(line); !read)
+            batch_.badRows.push_back({read.error(), std::string(line)});
+        else if (row_.kind().table == Table::Batches)
+            batch_.badRows.push_back({"only the first row is of kind device", std::string(line)});
+        else if (row_.text("device") != batch_.device || row_.text("epoch") != batch_.epoch)
+            batch_.badRows.push_back({"the first row is of another device or epoch", std::string(line)});
+        else
+            addRow(labels_);
+    }
+
+    void addRow(std::string_view labels)
+    {
+        constexpr double secondsOfWeek = 7 * 86400;
+        constexpr std::size_t usualRow = 768;
+        Row& row = batch_.rows.emplace_back();
+        row.table = row_.kind().table;
+        row.week = static_cast<std::uint32_t>(row_.number(row_.kind().week) / secondsOfWeek);
+        row.json.reserve(usualRow);
+        for (const Field& field : row_.kind().fields)
+            appendColumn(field, row_, row.json);
+        row.json += labels;
+        row.json += "}\n";
+    }
+
+    RowReader row_;
+    Batch batch_;
+    bool isBegun_ = false;
+    std::string labels_;
+};
+
+} // namespace
+
+std::expected<Batch, std::string> readLines(std::string_view lines)
+{
+    return BatchReader().read(lines);
+}
+
+std::expected<Batch, std::string> readBatch(std::string_view compressed)
+{
+    if (compressed.size() > largestBatch)
+        return std::unexpected(
+            fmt::format("it has {} compressed bytes; {} are the most", compressed.size(), largestBatch));
+    const auto lines = decompress(compressed, largestContent);
+    if (!lines)
+        return std::unexpected(lines.error());
+    return readLines(*lines);
+}
+
+} // namespace kesto_ingest

@@ -1,0 +1,47 @@
+// SPDX-License-Identifier: Apache-2.0
+// The room of batches: what a device sent in one message, opened, checked row by row, and written as rows of the
+// database. It knows neither the stream nor the database.
+//
+// A batch is newline-delimited JSON, compressed. Its first row is of the kind "device" and says whose batch it is. A
+// row that is wrong does not stop the others.
+#pragma once
+
+#include "kesto-ingest/batch/Schema.h"
+
+#include <cstddef>
+#include <cstdint>
+#include <expected>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace kesto_ingest {
+
+constexpr std::size_t largestBatch = 512 * 1024; // compressed
+constexpr std::size_t largestContent = 8 * 1024 * 1024;
+
+struct Row {
+    Table table;
+    std::uint32_t week; // since 1970
+    std::string json; // a line of JSONEachRow, with its end
+};
+
+struct BadRow {
+    std::string reason;
+    std::string line;
+};
+
+struct Batch {
+    std::string device; // the pseudonym
+    std::string epoch;
+    std::uint64_t last = 0; // the ID up to which the batch tells all that may be told
+    std::vector<Row> rows;
+    std::vector<BadRow> badRows;
+};
+
+// The error says why nothing of the batch can be used.
+[[nodiscard]] std::expected<Batch, std::string> readBatch(std::string_view compressed);
+// The same for lines that are not compressed.
+[[nodiscard]] std::expected<Batch, std::string> readLines(std::string_view lines);
+
+} // namespace kesto_ingest

@@ -1,0 +1,50 @@
+// SPDX-License-Identifier: Apache-2.0
+// Which keys each kind of row has, with their types and bounds, and which column of the database each becomes.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <span>
+#include <string_view>
+
+namespace kesto_ingest {
+
+enum class FieldType : std::uint8_t {
+    Digits, // 32 hexadecimal digits, lower case
+    Identity, // an integer of 63 bits, not negative
+    Moment, // seconds since 1970 UTC that a date of the database can express
+    Number, // finite
+    Length, // a number that is not negative
+    Count, // an integer of 32 bits, not negative
+    Integer, // of 64 bits
+    Flag, // a boolean
+    Text,
+    Object // JSON
+};
+
+enum class Table : std::uint8_t { Batches, Events, Stretches, Sessions };
+constexpr std::size_t tableCount = 4;
+
+struct Field {
+    std::string_view key;
+    FieldType type;
+    bool isRequired;
+    std::string_view column; // empty: it is no column
+};
+
+struct RowKind {
+    std::string_view name;
+    Table table;
+    std::string_view week; // the key of the moment whose week chooses the partition
+    std::span<const Field> fields;
+};
+
+constexpr std::size_t mostFields = 20; // of a row
+constexpr std::size_t longestText = 16 * 1024;
+constexpr double latestMoment = 4'294'967'295; // the end of 32 bits
+
+[[nodiscard]] std::string_view name(Table table) noexcept;
+// Null if there is none of that name.
+[[nodiscard]] const RowKind* kindNamed(std::string_view name) noexcept;
+
+} // namespace kesto_ingest
