@@ -182,7 +182,8 @@ private:
         ::sd_notifyf(0, "STATUS=%s", result.sentence.c_str());
         try {
             state_.noteAnswer({result.sentence, wallClock()});
-        } catch (const StateError&) { // the next round meets it, too
+        } catch (const StateError& error) {
+            log(error.what());
         }
     }
 
