@@ -57,8 +57,8 @@ public:
     ClickHouseServer server{directory / "clickhouse"};
 
 private:
-    // The first server is away at any time.
-    ClickHouse database_{{.servers = {"http://127.0.0.1:1", server.address()}}, [] { }};
+    // The first server is away at any time; what the second keeps must not go to the third, too.
+    ClickHouse database_{{.servers = {"http://127.0.0.1:1", server.address(), server.address()}}, [] { }};
 };
 
 std::unique_ptr<DatabaseProvider> makeProvider(const std::string& name)
