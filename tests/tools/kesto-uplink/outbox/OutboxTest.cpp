@@ -168,9 +168,8 @@ TEST_F(UplinkOutbox, GoesOnInTheDatabaseThatHasTheSavedRowsOfADamagedOne)
     MadeEventStore store(database);
     for (int count = 0; count < 9; ++count)
         store.addEvent(start);
-    store.execute(
-        "CREATE TABLE earlier_epochs(below INTEGER PRIMARY KEY, epoch TEXT NOT NULL);"
-        "INSERT INTO earlier_epochs VALUES (7, 'damaged'), (8, 'while it was repaired')");
+    store.execute("CREATE TABLE earlier_epochs(below INTEGER PRIMARY KEY, epoch TEXT NOT NULL);"
+                  "INSERT INTO earlier_epochs VALUES (7, 'damaged'), (8, 'while it was repaired')");
     EXPECT_EQ(outbox().next({"damaged", 4}, {}, 5000)->first, (Cursor{epoch, 5}));
     EXPECT_EQ(outbox().next({"damaged", 8}, {}, 5000)->first, (Cursor{epoch, 7})); // 7 and 8 are other rows here
     EXPECT_EQ(outbox().next({"damaged", 0}, {}, 5000)->first, (Cursor{epoch, 1}));
