@@ -153,8 +153,9 @@ protected:
             client::ListAllowance allowance;
             while (walk.logNextClient(allowance)) { }
             std::vector<std::shared_ptr<KestoReportingSession>> sessions;
-            while (auto session = walk.next())
-                sessions.push_back(std::move(session));
+            while (const auto step = walk.step())
+                if (*step != nullptr)
+                    sessions.push_back(*step);
             EXPECT_EQ(walk.count(), sessions.size());
             return sessions;
         });
