@@ -536,11 +536,14 @@ TEST_F(AnalyticsStoreTest, EndsWhileItWaitsForAQuietMoment)
 TEST_F(AnalyticsStoreTest, ALongLogIsMovedToTheDatabaseOnceItIsQuiet)
 {
     constexpr std::uintmax_t megabyte = 1024 * 1024;
-    sendALongLog();
-    for (int tries = 0; tries < 1000 && fs::file_size(file) < 8 * megabyte; ++tries)
-        std::this_thread::sleep_for(10ms);
+    int logs = 0;
+    for (; logs < 2 && (logs == 0 || fs::file_size(file) < 8 * megabyte); ++logs) { // three would not wait for quiet
+        sendALongLog(); // a busy machine may have been quiet in the middle of the first
+        for (int tries = 0; tries < 1000 && fs::file_size(file) < 8 * megabyte; ++tries)
+            std::this_thread::sleep_for(10ms);
+    }
     EXPECT_GT(fs::file_size(file), 8 * megabyte);
-    EXPECT_EQ(storedEvents(), 120);
+    EXPECT_EQ(storedEvents(), 120 * logs);
 }
 
 // --- The death of the service
