@@ -7,7 +7,6 @@
 #include "platform/linux/store/applications/KeyedHash.h"
 
 #include <algorithm>
-#include <cmath>
 #include <fmt/format.h>
 #include <utility>
 
@@ -63,11 +62,6 @@ const Rule* ruleOf(std::string_view key, const std::optional<std::vector<Rule>>&
 }
 
 } // namespace
-
-bool isWhole(double number)
-{
-    return std::abs(number) <= largestWhole && number == std::trunc(number);
-}
 
 Filter::Filter(AllowList allowed, std::string hashKey) : allowed_(std::move(allowed)), hashKey_(std::move(hashKey)) { }
 
@@ -138,11 +132,7 @@ std::optional<Value> Filter::ofColumn(const std::optional<std::vector<Rule>>& ru
     if (rule->action != Rule::Action::Bucket)
         return ofPayload(*rule, value);
     const auto bucket = bucketOf(value, rule->edges);
-    if (!bucket || *bucket == 0)
-        return std::nullopt;
-    const double edge = rule->edges[*bucket - 1];
-    // The text of a large double has an exponent, which is no whole number to a receiver.
-    return isWhole(edge) ? Value(static_cast<std::int64_t>(edge)) : Value(edge);
+    return bucket && *bucket > 0 ? std::optional<Value>(rule->edges[*bucket - 1]) : std::nullopt;
 }
 
 std::vector<Unused> Filter::unused() const

@@ -18,10 +18,6 @@
 
 namespace kesto_uplink {
 
-// Up to here, a double has every whole number.
-constexpr std::int64_t largestWhole = std::int64_t{1} << 53;
-[[nodiscard]] bool isWhole(double number); // and not larger
-
 struct Rule {
     enum class Action : std::uint8_t {
         Keep,

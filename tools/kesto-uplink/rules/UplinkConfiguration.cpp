@@ -110,6 +110,7 @@ struct Column {
     bool isNumber = false;
     std::optional<Range> whole = {}; // it is a whole number, and these can be edges
 };
+constexpr std::int64_t largestWhole = std::int64_t{1} << 53; // up to here, a double has every whole number
 constexpr Column stretchColumns[] = {
     {"device"}, {"format"}, {"channels", true, Column::Range{0, 4'294'967'295}}, {"volume", true}, {"application"}};
 constexpr Column sessionColumns[] = {
@@ -136,7 +137,8 @@ std::optional<std::vector<double>> edgesOf(const Value& value)
 bool canBeEdges(const std::vector<double>& edges, const Column::Range& range)
 {
     return std::ranges::all_of(edges, [&range](double edge) {
-        return isWhole(edge) && edge >= static_cast<double>(range.least) && edge <= static_cast<double>(range.most);
+        return edge == std::trunc(edge) && edge >= static_cast<double>(range.least)
+            && edge <= static_cast<double>(range.most);
     });
 }
 

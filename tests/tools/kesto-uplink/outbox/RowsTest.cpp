@@ -113,11 +113,11 @@ TEST(Rows, LeavesLongTextsOut)
 TEST(Rows, WritesTheEdgesOfWholeNumbersAsWholeNumbers)
 {
     UplinkConfiguration with = configuration();
-    const Rule millions{.key = "reporter", .action = Action::Bucket, .edges = {-2, 1'000'000}};
-    with.allowed.sessions = std::vector<Rule>{millions};
+    const Rule rule{.key = "reporter", .action = Action::Bucket, .edges = {-2, 9'007'199'254'740'992}};
+    with.allowed.sessions = std::vector<Rule>{rule};
     const Rows rows(with, identity());
-    EXPECT_THAT(rows.session({.id = 3, .reporter = 1'000'001}, epoch).value(),
-                testing::HasSubstr(R"("reporter":1000000,)"));
+    EXPECT_THAT(rows.session({.id = 3, .reporter = 9'007'199'254'740'993}, epoch).value(),
+                testing::HasSubstr(R"("reporter":9007199254740992,)"));
     EXPECT_THAT(rows.session({.id = 3, .reporter = -1}, epoch).value(), testing::HasSubstr(R"("reporter":-2,)"));
 }
 
