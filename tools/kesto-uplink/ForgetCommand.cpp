@@ -15,6 +15,7 @@ namespace {
 void forget(const Places& places)
 {
     // First what can fail: a device that could not forget all has forgotten nothing.
+    const EventDatabase isThere(places.database); // throws if not: what comes there later would leave
     const Cursor newest = StoreReader(places.database).newest();
     const double now = present();
     State state = State::open(places.state, now);

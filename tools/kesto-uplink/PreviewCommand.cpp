@@ -91,6 +91,9 @@ private:
         try {
             if (auto state = State::openPresent(options_.places.state)) {
                 identity_ = state->identity();
+                const UplinkConfiguration& configuration = checked_.configuration;
+                isRenewalDue_ = isOlder(identity_.pseudonymBorn, configuration.pseudonymDays, present())
+                    || isOlder(identity_.hashKeyBorn, configuration.hashKeyDays, present());
                 after_ = state->queued();
                 openSessions_ = state->openSessions();
                 return;
@@ -129,11 +132,17 @@ private:
                        options_.places.configuration.native());
         if (!hint_.empty())
             fmt::print(stderr, "{}.\n", hint_);
+        if (isRenewalDue_)
+            fmt::print(stderr,
+                       "The pseudonym or the key of hashes is older than the configuration allows: the next round "
+                       "renews it, and these lines leave with the new one.\n");
         fmt::print(stderr, "{} would leave (batches: {}; compressed: {}).\n", rowsText(sum_.rows), sum_.batches,
                    sizeText(static_cast<std::uint64_t>(sum_.bytes)));
         explain(sum_.leftOut.notAllowed, "stay, because no rule allows them");
-        explain(sum_.leftOut.unreadable,
-                "cannot leave, because their payload is no JSON object, or has a number that JSON has not");
+        explain(
+            sum_.leftOut.unreadable,
+            "cannot leave, because their payload is no JSON object or has a number that JSON has not, or their name "
+            "is longer than 16384 bytes");
         explain(sum_.leftOut.tooLarge, "cannot leave, because each alone is larger than a batch may be");
         if (sum_.leftOut.lostToAge > 0)
             fmt::print(stderr,
@@ -170,6 +179,7 @@ private:
                                               {"too_large", valueOf(sum_.leftOut.tooLarge)},
                                               {"lost_to_age", sum_.leftOut.lostToAge},
                                               {"pseudonym_is_made_up", !hint_.empty()},
+                                              {"renewal_is_due", isRenewalDue_},
                                               {"suspects", Array(std::move(sentences))}},
                                    line);
         fmt::print(stderr, "{}\n", line);
@@ -189,6 +199,7 @@ private:
     Cursor after_ = {};
     std::set<std::int64_t> openSessions_ = {};
     std::string hint_ = {};
+    bool isRenewalDue_ = false;
     Sum sum_ = {};
     std::vector<std::string> suspects_ = {};
 };

@@ -21,7 +21,6 @@
 #include <sysexits.h>
 #include <unistd.h>
 
-#include <algorithm>
 #include <chrono>
 #include <csignal>
 #include <cstdio>
@@ -63,9 +62,7 @@ double uptime()
 class OutboxSource : public Source {
 public:
     OutboxSource(const Places& places, const UplinkConfiguration& configuration, const Identity& identity)
-        : outbox_(places.database, configuration, identity,
-                  {.compressedBytes =
-                       std::min<std::size_t>(OutboxLimits().compressedBytes, configuration.maximumBytesADay)})
+        : outbox_(places.database, configuration, identity)
     {
     }
 

@@ -83,7 +83,8 @@ TEST_F(UplinkCommands, PreviewPrintsTheLinesThatWouldLeave)
                     "1 row would leave (batches: 1; compressed: N B).\n"
                     "These stay, because no rule allows them:\n"
                     "        1  com.quarn.music.Playback.Start\n"
-                    "These cannot leave, because their payload is no JSON object, or has a number that JSON has not:\n"
+                    "These cannot leave, because their payload is no JSON object or has a number that JSON has not, "
+                    "or their name is longer than 16384 bytes:\n"
                     "        1  com.quarn.kesto.Playback.Start\n");
     EXPECT_THAT(std::filesystem::is_empty(state), true);
 }
@@ -110,6 +111,25 @@ TEST_F(UplinkCommands, PreviewPrintsWhatIsSent)
     const Finished preview = run({"preview"});
     EXPECT_EQ(std::regex_replace(preview.output, std::regex("\"sent\":[0-9.]+"), "\"sent\":0"), sent);
     EXPECT_THAT(preview.errors, HasSubstr("4900 rows would leave (batches: 3; compressed: "));
+}
+
+TEST_F(UplinkCommands, PreviewSaysThatTheNextRoundRenewsThePseudonym)
+{
+    MadeEventStore store(database);
+    store.addEvent(start, R"({"key":1})");
+    static_cast<void>(State::open(state, 1'700'000'000));
+    constexpr const char* sentence = "The pseudonym or the key of hashes is older than the configuration allows: the "
+                                     "next round renews it, and these lines leave with the new one.\n";
+    for (const char* key : {"pseudonym_days", "hash_key_days"}) {
+        configure(std::string("pseudonym_days = 36500\nhash_key_days = 36500\n") + rules);
+        EXPECT_THAT(run({"preview"}).errors, Not(HasSubstr(sentence)));
+        EXPECT_THAT(run({"preview", "--json"}).errors, HasSubstr("\"renewal_is_due\":false"));
+        const std::string other = key == std::string("hash_key_days") ? "pseudonym_days" : "hash_key_days";
+        configure(std::string(key) + " = 1\n" + other + " = 36500\n" + rules);
+        EXPECT_THAT(run({"preview"}).errors, HasSubstr(sentence));
+        EXPECT_THAT(run({"preview", "--json"}).errors, HasSubstr("\"renewal_is_due\":true"));
+        EXPECT_THAT(run({"preview", "--json"}).errors, HasSubstr("\"pseudonym_is_made_up\":false"));
+    }
 }
 
 TEST_F(UplinkCommands, PreviewGoesBackToATime)
@@ -279,6 +299,19 @@ TEST_F(UplinkCommands, ForgetChangesNothingIfItCannotForgetAll)
     support::writeFile(database, "a text of a person, which is no database");
     const std::string before = State::open(state, 1000).identity().pseudonym;
     EXPECT_EQ(run({"forget"}).status, 1);
+    EXPECT_EQ(State::open(state, 1000).identity().pseudonym, before);
+}
+
+// The store that comes later may have rows that should not leave.
+TEST_F(UplinkCommands, ForgetNeedsAnEventStore)
+{
+    const std::string before = State::open(state, 1000).identity().pseudonym;
+    const Finished forgotten = run({"forget"});
+    EXPECT_EQ(forgotten.status, 1);
+    EXPECT_EQ(forgotten.output, "");
+    EXPECT_EQ(forgotten.errors,
+              "kesto-uplink: the event store " + database.native()
+                  + " does not exist: has kestod run? Name another with --database\n");
     EXPECT_EQ(State::open(state, 1000).identity().pseudonym, before);
 }
 

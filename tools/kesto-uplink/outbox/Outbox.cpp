@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // A batch is collected until it is full. One that is still too large when it is compressed is collected again with half
-// of the rows; a row that is too large alone is left out.
+// of the rows, and half of the sessions that have ended; a row that is too large alone is left out.
 #include "kesto-uplink/outbox/Outbox.h"
 
 #include "kesto-uplink/outbox/Compression.h"
@@ -57,6 +57,7 @@ struct Outbox::Draft {
     std::set<std::int64_t> sessions = {}; // that these name
     std::string sessionLines = {};
     std::int64_t sessionRows = 0;
+    std::int64_t endedSessions = 0; // those of which the draft has nothing else
     LeftOut leftOut = {};
     std::set<std::int64_t> openSessions = {};
 
@@ -95,18 +96,19 @@ std::optional<Batch> Outbox::next(const Cursor& after, const std::set<std::int64
 {
     tooLarge_.clear();
     std::int64_t mostRows = limits_.rows;
+    std::int64_t mostEnded = limits_.endedSessions;
     while (true) {
         auto draft = collect(after, mostRows);
         if (!draft)
             return std::nullopt;
-        addSessions(*draft, draft->after.epoch == after.epoch ? openSessions : std::set<std::int64_t>());
+        addSessions(*draft, draft->after.epoch == after.epoch ? openSessions : std::set<std::int64_t>(), mostEnded);
         Batch batch = finished(*draft, sent);
-        if (draft->rows == 0
-            || (batch.bytes.size() <= limits_.compressedBytes && batch.lines.size() <= limits_.wholeBytes))
+        if (batch.bytes.size() <= limits_.compressedBytes && batch.lines.size() <= limits_.wholeBytes)
             return batch;
-        if (draft->rows == 1)
+        if (draft->rows == 1 && draft->endedSessions == 0)
             tooLarge_.insert(draft->lastRow);
         mostRows = std::max<std::int64_t>(1, draft->rows / 2);
+        mostEnded = draft->endedSessions / 2;
     }
 }
 
@@ -178,17 +180,17 @@ bool Outbox::add(Draft& draft, const StoredStretch& stretch, const Slice& slice,
 // --- Sessions
 
 // With the rows of a session comes the session, and once more when it has ended.
-void Outbox::addSessions(Draft& draft, const std::set<std::int64_t>& openSessions)
+void Outbox::addSessions(Draft& draft, const std::set<std::int64_t>& openSessions, std::int64_t mostEnded)
 {
     if (!rows_.filter().allowsSessions())
         return;
     std::set<std::int64_t> wanted = draft.sessions;
     wanted.insert(openSessions.begin(), openSessions.end());
-    std::int64_t ended = 0;
     for (const StoredSession& session : store_.sessions(wanted, draft.after.epoch)) {
         const bool isNamed = draft.sessions.contains(session.id);
         const bool hasEnded = session.past && *session.past <= draft.last + 1;
-        if (isNamed || (hasEnded && ended++ < limits_.endedSessions)) {
+        if (isNamed || (hasEnded && draft.endedSessions < mostEnded)) {
+            draft.endedSessions += isNamed ? 0 : 1;
             const auto line = rows_.session(session, draft.after.epoch);
             draft.sessionLines += line.value_or(std::string());
             draft.sessionRows += line ? 1 : 0;

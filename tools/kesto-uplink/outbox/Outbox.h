@@ -49,7 +49,7 @@ struct Batch {
 
 // A batch is as large as a device with little memory makes it without pain: some 50 KB compressed.
 struct OutboxLimits {
-    std::size_t compressedBytes = std::size_t{512} * 1024;
+    std::size_t compressedBytes = largestBatch;
     std::size_t wholeBytes = std::size_t{8} * 1024 * 1024; // before they are compressed
     std::size_t rowBytes = std::size_t{512} * 1024; // of events and stretches, but at least one of them
     std::int64_t rows = 2048; // the same
@@ -83,7 +83,7 @@ private:
     [[nodiscard]] bool add(Draft& draft, const Slice& slice, std::int64_t mostRows);
     [[nodiscard]] bool add(Draft& draft, const StoredEvent& event, const Slice& slice, std::int64_t mostRows);
     [[nodiscard]] bool add(Draft& draft, const StoredStretch& stretch, const Slice& slice, std::int64_t mostRows);
-    void addSessions(Draft& draft, const std::set<std::int64_t>& openSessions);
+    void addSessions(Draft& draft, const std::set<std::int64_t>& openSessions, std::int64_t mostEnded);
     [[nodiscard]] Batch finished(const Draft& draft, double sent) const;
 
     StoreReader store_;

@@ -27,6 +27,11 @@ Value textOf(const std::string* text)
     return text != nullptr ? Value(*text) : Value();
 }
 
+bool isTooLong(const Value& value)
+{
+    return value.kind() == Value::Kind::String && value.stringView().size() > longestText;
+}
+
 } // namespace
 
 // A JSON object, written key by key. Keys are plain words.
@@ -50,7 +55,7 @@ public:
 
     Object& addIfAny(std::string_view key, const std::optional<Value>& value)
     {
-        return value && !value->isNull() ? add(key, *value) : *this;
+        return value && !value->isNull() && !isTooLong(*value) ? add(key, *value) : *this;
     }
 
     [[nodiscard]] Line line()
@@ -80,17 +85,17 @@ Rows::Line Rows::event(const StoredEvent& event, const std::string& epoch, const
     const auto parsed = parseJson(event.payload);
     const auto payload = parsed ? parsed->dictionary() : std::nullopt;
     const auto left = payload ? filter_.event(event.name, *payload) : std::nullopt;
-    if (!left)
+    if (!left || event.name.size() > longestText)
         return std::unexpected(WhyNot::Unreadable);
-    const Value* const ownApplication = left->find(applicationKey);
+    const Value* const own = left->find(applicationKey);
+    const bool hasOwn = own != nullptr && own->kind() == Value::Kind::String && !isTooLong(*own);
     return Object(pseudonym_, epoch, "event")
         .add("id", event.id)
         .add("time", event.time)
         .add("name", event.name)
         .addIfAny("session", valueOf(event.session))
         .addIfAny("happened", valueOf(event.happened))
-        .addIfAny("application",
-                  ownApplication != nullptr ? *ownApplication : filter_.ofSession("application", textOf(application)))
+        .addIfAny("application", hasOwn ? *own : filter_.ofSession("application", textOf(application)))
         .add("payload", *left)
         .line();
 }

@@ -14,7 +14,7 @@ namespace kesto_uplink {
 
 enum class WhyNot : std::uint8_t {
     NotAllowed, // no rule is about it
-    Unreadable // its payload is no JSON object, or it has a number that JSON cannot express
+    Unreadable // its payload is no JSON object, it has a number that JSON cannot express, or its name is too long
 };
 
 // One thread.
@@ -22,7 +22,7 @@ class Rows {
 public:
     Rows(const UplinkConfiguration& configuration, const Identity& identity);
 
-    // Each a line with its end. The application is that of the row's session.
+    // Each a line with its end, without columns of too long a text. The application is that of the row's session.
     using Line = std::expected<std::string, WhyNot>;
     [[nodiscard]] Line event(const StoredEvent& event, const std::string& epoch, const std::string* application);
     [[nodiscard]] Line stretch(const StoredStretch& stretch, const std::string& epoch,

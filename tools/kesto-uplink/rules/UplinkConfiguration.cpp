@@ -29,15 +29,10 @@ namespace {
 
 constexpr double longestInterval = 7.0 * 86'400;
 
-bool isText(const Value& value)
-{
-    return value.kind() == Value::Kind::String && !value.stringView().empty();
-}
-
 bool readText(const Value& value, std::string& setting)
 {
     setting = value.stringView();
-    return isText(value);
+    return !setting.empty() && setting.size() <= longestText;
 }
 
 bool readPath(const Value& value, std::filesystem::path& setting)
@@ -82,11 +77,11 @@ constexpr Setting<UplinkConfiguration> settings[] = {
      [](const Value& value, UplinkConfiguration& to) {
          return readPositive(value, to.intervalSeconds) && to.intervalSeconds <= longestInterval;
      }},
-    {"maximum_bytes_a_day", "a whole number of bytes above 0",
+    {"maximum_bytes_a_day", "a whole number of bytes, at least 524288, which is the largest batch",
      [](const Value& value, UplinkConfiguration& to) {
          const auto bytes = value.exactly<std::uint64_t>();
          to.maximumBytesADay = bytes.value_or(to.maximumBytesADay);
-         return bytes.value_or(0) > 0;
+         return bytes.value_or(0) >= largestBatch;
      }},
     {"metered", "true or false",
      [](const Value& value, UplinkConfiguration& to) { return platform::readBoolean(value, to.metered); }}};
@@ -94,8 +89,10 @@ constexpr Setting<UplinkConfiguration> settings[] = {
 constexpr std::array<std::string_view, 4> tables = {"device", "events", "stretches", "sessions"};
 
 constexpr Setting<UplinkConfiguration> labels[] = {
-    {"model", "a text", [](const Value& value, UplinkConfiguration& to) { return readText(value, to.model); }},
-    {"version", "a text", [](const Value& value, UplinkConfiguration& to) { return readText(value, to.version); }}};
+    {"model", "a text of 1 to 16384 bytes",
+     [](const Value& value, UplinkConfiguration& to) { return readText(value, to.model); }},
+    {"version", "a text of 1 to 16384 bytes",
+     [](const Value& value, UplinkConfiguration& to) { return readText(value, to.version); }}};
 
 auto keysOf(std::span<const Setting<UplinkConfiguration>> of)
 {
@@ -105,11 +102,19 @@ auto keysOf(std::span<const Setting<UplinkConfiguration>> of)
 // --- Rules
 
 struct Column {
+    struct Range {
+        std::int64_t least = 0;
+        std::int64_t most = 0;
+    };
     std::string_view name;
     bool isNumber = false;
+    std::optional<Range> whole = {}; // it is a whole number, and these can be edges
 };
-constexpr Column stretchColumns[] = {{"device"}, {"format"}, {"channels", true}, {"volume", true}, {"application"}};
-constexpr Column sessionColumns[] = {{"reporter", true}, {"service"}, {"application"}, {"process"}};
+constexpr std::int64_t largestWhole = std::int64_t{1} << 53; // up to here, a double has every whole number
+constexpr Column stretchColumns[] = {
+    {"device"}, {"format"}, {"channels", true, Column::Range{0, 4'294'967'295}}, {"volume", true}, {"application"}};
+constexpr Column sessionColumns[] = {
+    {"reporter", true, Column::Range{-largestWhole, largestWhole}}, {"service"}, {"application"}, {"process"}};
 
 constexpr std::string_view whatRulesAre = R"("keep", "drop", "hash" or a bucket such as { bucket = [1, 10, 60] })";
 
@@ -127,6 +132,14 @@ std::optional<std::vector<double>> edgesOf(const Value& value)
         edges.push_back(number->doubleValue());
     }
     return edges;
+}
+
+bool canBeEdges(const std::vector<double>& edges, const Column::Range& range)
+{
+    return std::ranges::all_of(edges, [&range](double edge) {
+        return edge == std::trunc(edge) && edge >= static_cast<double>(range.least)
+            && edge <= static_cast<double>(range.most);
+    });
 }
 
 // --- The file
@@ -237,6 +250,10 @@ private:
                                fmt::format("{} is a number, and a hash is not: use \"keep\", \"drop\" or a bucket "
                                            "such as {{ bucket = [1, 10, 60] }}",
                                            way.back()));
+            if (rule && column->whole && !canBeEdges(rule->edges, *column->whole))
+                return problem(way,
+                               fmt::format("the edges of {} should be whole numbers from {} to {}", way.back(),
+                                           column->whole->least, column->whole->most));
             if (rule)
                 rules.push_back(*std::move(rule));
         });

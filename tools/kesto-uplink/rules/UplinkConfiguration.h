@@ -8,6 +8,7 @@
 
 #include "kesto-uplink/rules/AllowList.h"
 
+#include <cstddef>
 #include <cstdint>
 #include <filesystem>
 #include <string>
@@ -22,12 +23,16 @@ enum class ForgetWhen : std::uint8_t {
     Queued // the stream of the servers has them
 };
 
+// Of the fleet's protocol.
+constexpr std::size_t largestBatch = std::size_t{512} * 1024; // compressed
+constexpr std::size_t longestText = 16'384; // in bytes, of texts outside of payloads
+
 struct UplinkConfiguration {
     bool enabled = false;
     std::vector<std::string> servers; // such as "tls://reports.example:4222"
     std::filesystem::path credentials; // empty: none
     std::filesystem::path ca; // of the servers' certificates; empty: the system's
-    double pseudonymDays = 90; // a pseudonym is not used for longer
+    double pseudonymDays = 90; // after that the pseudonym is due for renewal
     double hashKeyDays = 90;
     ForgetWhen forgetWhen = ForgetWhen::Stored;
     double intervalSeconds = 900; // at most one wake-up in each

@@ -382,23 +382,28 @@ void State::setOpenSessions(const std::set<std::int64_t>& sessions)
 }
 
 // A clock that was set back makes nothing older.
+bool isOlder(double born, double days, double now)
+{
+    constexpr double secondsOfDay = 86'400;
+    return now - born > days * secondsOfDay;
+}
+
+// With the pseudonym goes what would connect it to the next: the key of its hashes, and the sessions that it has begun.
 Renewal State::renew(double pseudonymDays, double hashKeyDays, double now)
 {
     Renewal result = Renewal::NotDue;
     inTransaction([&] {
-        constexpr double secondsOfDay = 86'400;
         Identity current = identity();
         const Identity fresh = newIdentity(now);
-        const bool isHashKeyDue = now - current.hashKeyBorn > hashKeyDays * secondsOfDay;
-        if (isHashKeyDue) {
+        if (isOlder(current.hashKeyBorn, hashKeyDays, now)) {
             current.hashKey = fresh.hashKey;
             current.hashKeyBorn = now;
             result = Renewal::Renewed;
         }
-        const bool isDue = now - current.pseudonymBorn > pseudonymDays * secondsOfDay;
+        const bool isDue = isOlder(current.pseudonymBorn, pseudonymDays, now);
         if (isDue && queued() == stored()) {
-            current.pseudonym = fresh.pseudonym;
-            current.pseudonymBorn = now;
+            current = fresh;
+            setOpenSessions({});
             result = Renewal::Renewed;
         } else if (isDue)
             result = Renewal::Waiting;

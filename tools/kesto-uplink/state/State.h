@@ -41,6 +41,8 @@ struct Identity {
 };
 
 [[nodiscard]] Identity newIdentity(double now);
+// What was made at `born` is due for renewal.
+[[nodiscard]] bool isOlder(double born, double days, double now);
 
 // Sums since the file was made.
 struct Totals {
@@ -118,7 +120,7 @@ public:
     void noteOn(double now); // nothing changes if it is on already
     void noteOff();
 
-    // Renews the pseudonym and the hash key if they are older.
+    // Renews the hash key if it is older, and the pseudonym, with the hash key, if that is older.
     Renewal renew(double pseudonymDays, double hashKeyDays, double now);
     // A new pseudonym and a new hash key. Nothing that the store has kept up to `newest` leaves any more.
     void forget(const Cursor& newest, double now);

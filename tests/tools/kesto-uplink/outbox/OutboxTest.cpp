@@ -168,8 +168,7 @@ TEST_F(UplinkOutbox, GoesOnInTheDatabaseThatHasTheSavedRowsOfADamagedOne)
     MadeEventStore store(database);
     for (int count = 0; count < 9; ++count)
         store.addEvent(start);
-    store.execute("CREATE TABLE earlier_epochs(below INTEGER PRIMARY KEY, epoch TEXT NOT NULL);"
-                  "INSERT INTO earlier_epochs VALUES (7, 'damaged'), (8, 'while it was repaired')");
+    store.execute("INSERT INTO earlier_epochs VALUES (7, 'damaged'), (8, 'while it was repaired')");
     EXPECT_EQ(outbox().next({"damaged", 4}, {}, 5000)->first, (Cursor{epoch, 5}));
     EXPECT_EQ(outbox().next({"damaged", 8}, {}, 5000)->first, (Cursor{epoch, 7})); // 7 and 8 are other rows here
     EXPECT_EQ(outbox().next({"damaged", 0}, {}, 5000)->first, (Cursor{epoch, 1}));
@@ -317,6 +316,52 @@ TEST_F(UplinkOutbox, SpreadsTheEndsOfManySessions)
     const auto batch = next(0, open, {.endedSessions = 2});
     EXPECT_THAT(keysIn({*batch}), ElementsAre("session 1", "session 2", "event 1"));
     EXPECT_THAT(batch->openSessions, ElementsAre(3, 4, 5));
+}
+
+// Else the ends of many sessions would make a batch too large, and its rows would be blamed for it.
+TEST_F(UplinkOutbox, SpreadsTheEndsOfLargeSessions)
+{
+    MadeEventStore store(database);
+    std::set<std::int64_t> open;
+    for (std::int64_t id = 1; id <= 8; ++id) {
+        store.addSession(id, noise(1000));
+        store.endSession(id);
+        open.insert(id);
+    }
+    store.addEvent(start);
+    store.addEvent(start);
+    for (const OutboxLimits& limits : {OutboxLimits{.compressedBytes = 3000}, OutboxLimits{.wholeBytes = 6000}}) {
+        Outbox reader = outbox(limits);
+        const auto batches = allBatches(reader, {epoch, 0}, open);
+        ASSERT_FALSE(batches.empty());
+        for (const Batch& batch : batches) {
+            EXPECT_THAT(batch.leftOut.tooLarge, IsEmpty());
+            EXPECT_LE(batch.bytes.size(), limits.compressedBytes);
+            EXPECT_LE(batch.lines.size(), limits.wholeBytes);
+        }
+        const auto keys = keysIn(batches);
+        EXPECT_THAT(keys, testing::Contains("event 1"));
+        EXPECT_THAT(keys, testing::Contains("event 2"));
+        EXPECT_THAT(keys, testing::Contains("session 1"));
+        EXPECT_EQ(keys.size() - 2 + batches.back().openSessions.size(), 8U);
+    }
+}
+
+// A range without rows may also end more sessions than fit.
+TEST_F(UplinkOutbox, SpreadsTheEndsOfLargeSessionsWithoutRows)
+{
+    MadeEventStore store(database);
+    std::set<std::int64_t> open;
+    for (std::int64_t id = 1; id <= 8; ++id) {
+        store.addSession(id, noise(1000));
+        store.endSession(id);
+        open.insert(id);
+    }
+    store.addEvent(other);
+    const auto batch = next(0, open, {.wholeBytes = 4000});
+    EXPECT_THAT(keysIn({*batch}), ElementsAre("session 1", "session 2"));
+    EXPECT_THAT(batch->openSessions, ElementsAre(3, 4, 5, 6, 7, 8));
+    EXPECT_EQ(batch->last.id, 1);
 }
 
 TEST_F(UplinkOutbox, SendsNoSessionsIfNoneMayLeave)

@@ -64,6 +64,63 @@ TEST(Rows, NamesTheApplicationOfTheSessionIfThatMayLeave)
     EXPECT_THAT(rows.event(event, epoch, &player).value(), testing::HasSubstr(R"("application":"org.example.player")"));
 }
 
+// Receivers refuse a row whose application is no text, or a long one.
+TEST(Rows, TakesTheSessionsApplicationInPlaceOfOneThatIsNone)
+{
+    UplinkConfiguration telling = configuration();
+    telling.allowed.sessions = std::vector<Rule>{{.key = "application", .action = Action::Keep}};
+    Rows rows(telling, identity());
+    const auto lineOf = [&rows](const std::string& application, const std::string& ofSession = player) {
+        return rows
+            .event({.id = 8,
+                    .name = "com.quarn.kesto.x",
+                    .payload = R"({"HostApplicationDisplayID":)" + application + "}"},
+                   epoch, &ofSession)
+            .value();
+    };
+    for (const std::string& none : {std::string("7"), std::string("{\"a\":\"b\"}"), std::string("[\"b\"]"),
+                                    std::string("null"), "\"" + std::string(16'385, 'a') + "\""})
+        EXPECT_EQ(lineOf(none),
+                  std::string(begin)
+                      + R"("kind":"event","id":8,"time":0,"name":"com.quarn.kesto.x",)"
+                        R"("application":"org.example.player","payload":{"HostApplicationDisplayID":)"
+                      + none + "}}\n");
+    const std::string longest(16'384, 'a');
+    EXPECT_THAT(lineOf("\"" + longest + "\""), testing::HasSubstr(R"("application":")" + longest + "\""));
+    EXPECT_THAT(lineOf("7", longest + "a"), testing::Not(testing::HasSubstr("application\"")));
+}
+
+TEST(Rows, LeavesLongTextsOut)
+{
+    UplinkConfiguration with = configuration();
+    with.allowed.stretches = std::vector<Rule>{{.key = "device", .action = Action::Keep}};
+    with.allowed.sessions = std::vector<Rule>{{.key = "service", .action = Action::Keep}};
+    const std::string text(16'385, 'a');
+    EXPECT_EQ(Rows(with, identity()).stretch({.id = 9, .device = text, .ending = "change"}, epoch, nullptr),
+              std::string(begin)
+                  + R"("kind":"stretch","id":9,"recording":false,"began":0,"seconds":0,"ending":"change"})"
+                    "\n");
+    EXPECT_EQ(Rows(with, identity()).session({.id = 3, .service = text}, epoch),
+              std::string(begin)
+                  + R"("kind":"session","id":3,"began":0})"
+                    "\n");
+    with.allowed.events[0].names = "*";
+    Rows rows(with, identity());
+    EXPECT_EQ(rows.event({.id = 1, .name = text, .payload = "{}"}, epoch, nullptr).error(), WhyNot::Unreadable);
+    EXPECT_TRUE(rows.event({.id = 1, .name = text.substr(1), .payload = "{}"}, epoch, nullptr));
+}
+
+TEST(Rows, WritesTheEdgesOfWholeNumbersAsWholeNumbers)
+{
+    UplinkConfiguration with = configuration();
+    const Rule rule{.key = "reporter", .action = Action::Bucket, .edges = {-2, 9'007'199'254'740'992}};
+    with.allowed.sessions = std::vector<Rule>{rule};
+    const Rows rows(with, identity());
+    EXPECT_THAT(rows.session({.id = 3, .reporter = 9'007'199'254'740'993}, epoch).value(),
+                testing::HasSubstr(R"("reporter":9007199254740992,)"));
+    EXPECT_THAT(rows.session({.id = 3, .reporter = -1}, epoch).value(), testing::HasSubstr(R"("reporter":-2,)"));
+}
+
 TEST(Rows, KeepsTheDigitsOfNumbers)
 {
     Rows rows(configuration(), identity());

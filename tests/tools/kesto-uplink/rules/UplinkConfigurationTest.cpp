@@ -133,10 +133,18 @@ TEST(UplinkConfiguration, SaysWhatAValueShouldBe)
     EXPECT_THAT(problems("interval = inf"), SizeIs(1));
     EXPECT_THAT(problems("interval = 700000"), SizeIs(1));
     EXPECT_THAT(problems("maximum_bytes_a_day = -1"), SizeIs(1));
+    // A day must have room for the largest batch, else that batch would never leave.
+    EXPECT_THAT(problems("maximum_bytes_a_day = 524287"),
+                ElementsAre("/etc/kesto/uplink.toml:1: maximum_bytes_a_day = 524287 should be a whole number of "
+                            "bytes, at least 524288, which is the largest batch"));
+    EXPECT_THAT(problems("maximum_bytes_a_day = 524288"), IsEmpty());
     EXPECT_THAT(problems("maximum_bytes_a_day = 1.5"), SizeIs(1));
     EXPECT_THAT(problems("pseudonym_days = true"), SizeIs(1));
     EXPECT_THAT(problems("events = 1"), SizeIs(1));
-    EXPECT_THAT(problems("[device]\nmodel = \"\"\n"), SizeIs(1));
+    EXPECT_THAT(problems("[device]\nmodel = \"\"\n"),
+                ElementsAre("/etc/kesto/uplink.toml:2: model =  should be a text of 1 to 16384 bytes"));
+    EXPECT_THAT(problems("[device]\nversion = \"" + std::string(16'385, 'v') + "\"\n"), SizeIs(1));
+    EXPECT_THAT(problems("[device]\nversion = \"" + std::string(16'384, 'v') + "\"\n"), IsEmpty());
 }
 
 TEST(UplinkConfiguration, SaysWhatARuleIs)
@@ -158,6 +166,23 @@ TEST(UplinkConfiguration, SaysWhatARuleIs)
     EXPECT_THAT(problems("[stretches]\nvolume = \"hash\"\n"),
                 ElementsAre("/etc/kesto/uplink.toml:2: volume is a number, and a hash is not: use \"keep\", \"drop\" "
                             "or a bucket such as { bucket = [1, 10, 60] }"));
+}
+
+// An edge takes the place of the number, and receivers refuse what is no number of this column.
+TEST(UplinkConfiguration, SaysWhichEdgesAColumnCanHave)
+{
+    EXPECT_THAT(problems("[stretches]\nchannels = { bucket = [1, 2.5] }\n"),
+                ElementsAre("/etc/kesto/uplink.toml:2: the edges of channels should be whole numbers from 0 to "
+                            "4294967295"));
+    EXPECT_THAT(problems("[stretches]\nchannels = { bucket = [-1, 2] }\n"), SizeIs(1));
+    EXPECT_THAT(problems("[stretches]\nchannels = { bucket = [4294967296] }\n"), SizeIs(1));
+    EXPECT_THAT(problems("[stretches]\nchannels = { bucket = [0, 4294967295] }\n"), IsEmpty());
+    EXPECT_THAT(problems("[stretches]\nvolume = { bucket = [-0.5, 0.5] }\n"), IsEmpty());
+    EXPECT_THAT(problems("[sessions]\nreporter = { bucket = [0.5] }\n"),
+                ElementsAre("/etc/kesto/uplink.toml:2: the edges of reporter should be whole numbers from "
+                            "-9007199254740992 to 9007199254740992"));
+    EXPECT_THAT(problems("[sessions]\nreporter = { bucket = [1e300] }\n"), SizeIs(1));
+    EXPECT_THAT(problems("[sessions]\nreporter = { bucket = [-100000, 100000] }\n"), IsEmpty());
 }
 
 TEST(UplinkConfiguration, SaysThatNamesOfEventsStandInQuotes)

@@ -5,6 +5,7 @@
 #include "support/TemporaryDirectory.h"
 #include "support/Victim.h"
 
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
 #include <gmock/gmock.h>
@@ -238,8 +239,10 @@ TEST_F(UplinkState, RenewsWhatIsTooOld)
     EXPECT_EQ(state.renew(10, 100, 11 * day), Renewal::Renewed);
     const Identity third = state.identity();
     EXPECT_NE(third.pseudonym, first.pseudonym);
-    EXPECT_EQ(third.hashKey, second.hashKey);
     EXPECT_EQ(third.pseudonymBorn, 11 * day);
+    // The hashes under two pseudonyms would connect them.
+    EXPECT_NE(third.hashKey, second.hashKey);
+    EXPECT_EQ(third.hashKeyBorn, 11 * day);
     EXPECT_EQ(state.renew(10, 100, 1 * day), Renewal::NotDue); // the clock was set back
 }
 
@@ -248,35 +251,50 @@ TEST_F(UplinkState, RenewsThePseudonymWhenAllIsStored)
 {
     State state = open(0);
     const Identity as = state.identity();
-    EXPECT_TRUE(state.noteQueued(as, sent("e", 20), 20));
+    Progress progress = sent("e", 20);
+    progress.openSessions = {7};
+    EXPECT_TRUE(state.noteQueued(as, progress, 20));
     EXPECT_EQ(state.renew(10, 100, 11 * day), Renewal::Waiting);
     EXPECT_EQ(state.identity().pseudonym, as.pseudonym);
+    EXPECT_THAT(state.openSessions(), ElementsAre(7));
     EXPECT_TRUE(state.noteStored(as, {"e", 20}));
     EXPECT_EQ(state.renew(10, 100, 11 * day), Renewal::Renewed);
     EXPECT_NE(state.identity().pseudonym, as.pseudonym);
     EXPECT_EQ(state.queued(), (Cursor{"e", 20}));
+    // The session's beginning left under the old pseudonym, so its end leaves under none.
+    EXPECT_THAT(state.openSessions(), IsEmpty());
+}
+
+// 0 while the file is being written.
+std::int64_t lastTold(const std::filesystem::path& file)
+{
+    std::int64_t last = 0;
+    std::ifstream(file) >> last;
+    return last;
 }
 
 // The killed process notes 1, 2, 3... and says so each time: at most the note that it has not told is there.
 TEST_F(UplinkState, LosesNothingWhenItIsKilled)
 {
     for (int attempt = 0; attempt < 10; ++attempt) {
-        static_cast<void>(open());
+        const std::int64_t before = open().queued().id;
         const std::filesystem::path told = directory / "told";
         support::writeFile(told, "0");
+        std::int64_t last = 0;
         {
-            support::Victim victim(support::Victim::Unawaited(), [&] {
+            const support::Victim victim(support::Victim::Unawaited(), [&] {
                 State state = open();
                 const Identity as = state.identity();
-                const std::int64_t first = state.queued().id;
-                for (std::int64_t id = first + 1; state.noteQueued(as, sent("e", id), 20); ++id)
+                for (std::int64_t id = before + 1; state.noteQueued(as, sent("e", id), 20); ++id)
                     std::ofstream(told) << id << '\n' << std::flush;
                 return false;
             });
-            ::usleep(20'000 + attempt * 3000);
+            for (int wait = 0; last <= before && wait < 10'000; ++wait, ::usleep(1000))
+                last = lastTold(told);
+            ASSERT_GT(last, before);
+            ::usleep(attempt * 3000); // so that each kill meets another moment
         }
-        std::int64_t last = 0;
-        std::ifstream(told) >> last;
+        last = std::max(last, lastTold(told));
         State state = open();
         EXPECT_GE(state.queued().id, last);
         EXPECT_EQ(state.totals().batches, state.queued().id);
