@@ -92,7 +92,7 @@ protected:
                 .maximumBytesADay = 1000,
                 .pseudonymDays = 90,
                 .hashKeyDays = 90,
-                .waitForConfirmation = std::chrono::milliseconds(20)};
+                .waitForConfirmation = std::chrono::seconds(10)};
     bool isMetered = false;
     bool lacksPermission = false;
     bool isInterrupted = false;

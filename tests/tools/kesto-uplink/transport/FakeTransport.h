@@ -5,6 +5,7 @@
 #include "kesto-uplink/transport/Transport.h"
 
 #include <algorithm>
+#include <chrono>
 #include <condition_variable>
 #include <deque>
 #include <functional>
@@ -38,8 +39,9 @@ public:
     // What servers would refuse.
     bool hasWrongPassword = false;
     bool lacksPermission = false;
-    // Answers nothing; `put` then waits for `interrupt`, or its time limit, which is short.
+    // Answers nothing; `put` then waits for `interrupt`, or its time limit.
     bool isFrozen = false;
+    std::chrono::milliseconds timeLimit{};
 
     Answer connect() override
     {
@@ -63,7 +65,7 @@ public:
             return away("there is no connection");
         if (isFrozen) {
             std::unique_lock lock(mutex_);
-            interruption_.wait_for(lock, std::chrono::milliseconds(200), [this] { return isInterrupted_; });
+            interruption_.wait_for(lock, timeLimit, [this] { return isInterrupted_; });
         }
         if (isInterrupted())
             return {Kind::Interrupted, false, {}};

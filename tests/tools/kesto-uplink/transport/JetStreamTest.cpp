@@ -23,7 +23,10 @@ using testing::HasSubstr;
 using testing::Not;
 
 const Credentials alpha{.name = "alpha", .password = "secret", .isPlain = true};
-constexpr kesto_uplink::TimeLimits limits{.connect = 2s, .answer = 400ms};
+// What must come may take long on a busy machine.
+constexpr kesto_uplink::TimeLimits limits{.connect = 10s, .answer = 10s};
+// Of calls that no server ever answers, so that they wait so long each time.
+constexpr kesto_uplink::TimeLimits limitsWithoutAnswer{.connect = 10s, .answer = 5s};
 
 // An authority, and a server's certificate for a host, as an administrator makes them.
 class Certificates {
@@ -199,7 +202,7 @@ TEST(JetStream, aServerThatRefusesIsToldBeforeOneThatIsAway)
 TEST(JetStream, serversWithoutTheStreamAreAway)
 {
     NatsServer server({.hasStreams = false});
-    JetStream transport({.urls = {server.url()}}, alpha, limits);
+    JetStream transport({.urls = {server.url()}}, alpha, limitsWithoutAnswer);
     ASSERT_TRUE(transport.connect().isStored());
     const Answer answer = transport.put("a", "1");
     EXPECT_EQ(answer.kind, Answer::Kind::Away);
@@ -222,7 +225,8 @@ TEST(JetStream, aBatchThatIsLargerThanTheServerAllowsIsRefused)
 TEST(JetStream, aSentenceOfARefusalNamesTheSubject)
 {
     const NatsServer server;
-    JetStream forger({.urls = {server.url()}}, {.name = "forger", .password = "secret", .isPlain = true}, limits);
+    JetStream forger({.urls = {server.url()}}, {.name = "forger", .password = "secret", .isPlain = true},
+                     limitsWithoutAnswer);
     ASSERT_TRUE(forger.connect().isStored());
     EXPECT_THAT(forger.put("a", "1").sentence, HasSubstr("kesto.events.forger"));
 }
