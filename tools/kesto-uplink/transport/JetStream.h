@@ -55,6 +55,7 @@ private:
 
     [[nodiscard]] Options optionsFor(const std::string& url);
     [[nodiscard]] Answer connectTo(const std::string& url);
+    [[nodiscard]] Answer withoutConnection();
     // What the end of a call means that did not succeed.
     [[nodiscard]] Answer failure(natsStatus status, jsErrCode code);
     [[nodiscard]] Answer confirmationsFailed(natsStatus status);
