@@ -26,6 +26,7 @@ struct FakeStream {
     int connections = 0; // so far
     unsigned losesConnectionsAfter = 0; // so many batches; 0: never
     bool hasConfirmations = true;
+    std::function<void()> afterConnecting;
     std::function<void()> afterStoring; // before the device gets its answer
 };
 
@@ -54,7 +55,10 @@ public:
             return {Kind::Refused, false, "wrong password: check the credentials file"};
         ++stream_.connections;
         putsOfConnection_ = 0;
-        return connected_ = true, Answer{};
+        connected_ = true;
+        if (stream_.afterConnecting)
+            stream_.afterConnecting();
+        return {};
     }
 
     void disconnect() override { connected_ = false; }
