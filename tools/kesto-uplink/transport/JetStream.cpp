@@ -96,11 +96,6 @@ JetStream::JetStream(Servers servers, Credentials credentials, TimeLimits limits
     std::ranges::shuffle(servers_.urls, std::mt19937(std::random_device()()));
 }
 
-JetStream::~JetStream()
-{
-    disconnect();
-}
-
 // In milliseconds.
 std::int64_t JetStream::timeFor(std::size_t bytes) const
 {

@@ -34,7 +34,6 @@ struct TimeLimits {
 class JetStream : public Transport {
 public:
     JetStream(Servers servers, Credentials credentials, TimeLimits limits = {});
-    ~JetStream() override;
 
     Answer connect() override;
     void disconnect() override;
@@ -70,7 +69,7 @@ private:
 
     std::mutex mutex_; // of the two below, while connections are exchanged or interrupted
     bool isInterrupted_ = false;
-    Connection connection_;
+    Connection connection_; // destroyed behind what uses it
     std::string server_; // of the connection
     Context context_;
     Subscription confirmations_;
