@@ -42,6 +42,8 @@ RoundResult Round::run()
 {
     isForgotten_ = false;
     complaint_.clear();
+    if (terms_.forgetWhen == ForgetWhen::Queued && awaitsConfirmation()) // the terms were others before
+        keep(state_.noteAllStored(state_.identity()));
     const bool isPseudonymDue =
         state_.renew(terms_.pseudonymDays, terms_.hashKeyDays, clock_().now) == Renewal::Waiting;
     identity_ = state_.identity();
@@ -51,15 +53,15 @@ RoundResult Round::run()
         return {};
     if (auto reason = whyNotNow(*batch))
         return *std::move(reason);
-    const Answer connected = transport_.connect();
+    const Answer connected = connect();
     if (!connected.isStored())
         return {outcomeOf(connected.kind), connected.sentence};
-    askForConfirmation();
-    RoundResult result = sendConnected(std::move(batch), isPseudonymDue);
+    RoundResult result = sendConnected(*std::move(batch), isPseudonymDue);
     if (result.outcome != Outcome::Interrupted)
         awaitConfirmation();
     transport_.disconnect();
-    if (result.outcome == Outcome::Sent && !complaint_.empty())
+    const bool isWell = result.outcome == Outcome::Sent || result.outcome == Outcome::Waiting;
+    if (isWell && !complaint_.empty())
         result.sentence += "; no confirmation: " + complaint_;
     return result;
 }
@@ -88,58 +90,88 @@ std::optional<RoundResult> Round::whyNotNow(const Batch& batch)
     return std::nullopt;
 }
 
-RoundResult Round::sendConnected(std::optional<Batch> batch, bool isPseudonymDue)
+RoundResult Round::sendConnected(Batch batch, bool isPseudonymDue)
 {
-    if (goesBack()) { // also under a pseudonym that is due, so that the fleet sees each row under one
+    if (goesBack(batch)) { // also under a pseudonym that is due, so that the fleet sees each row under one
         keep(state_.sendAgain(identity_));
         patience_.rest();
-        batch = nextToSend();
-    } else if (isPseudonymDue && awaitsConfirmation())
-        return {Outcome::Waiting, "waiting for the fleet to confirm what was sent under the old pseudonym"};
-    else if (isPseudonymDue)
-        return {Outcome::Waiting, "everything is confirmed; the next round has a new pseudonym"};
+        return sendAll(nextToSend());
+    }
+    if (isPseudonymDue)
+        return awaitRenewal();
     return sendAll(std::move(batch));
 }
 
-// Whether the stream seems to have lost what it had: the fleet answers, and has not confirmed it for long.
-bool Round::goesBack()
+// Whether the stream seems to have lost what it had: the fleet answers, and has not confirmed it for long. What was
+// sent from another store stays: its rows are gone, or have other keys here.
+bool Round::goesBack(const Batch& next)
 {
-    return terms_.forgetWhen == ForgetWhen::Stored && complaint_.empty() && awaitsConfirmation()
-        && patience_.isOver(state_.stored(), clock_().now);
+    return terms_.forgetWhen == ForgetWhen::Stored && complaint_.empty() && next.first.epoch == state_.queued().epoch
+        && isPatienceOver();
 }
 
+bool Round::isPatienceOver()
+{
+    return awaitsConfirmation() && patience_.isOver(state_.stored(), clock_().now);
+}
+
+// Gives up what is not confirmed for a day and cannot be sent again: else the device would keep the pseudonym for ever.
+RoundResult Round::awaitRenewal()
+{
+    if (isPatienceOver()) {
+        keep(state_.noteAllStored(identity_));
+        patience_.rest();
+        return {Outcome::Waiting, "nothing was confirmed for a day; the next round has a new pseudonym"};
+    }
+    if (!awaitsConfirmation())
+        return {Outcome::Waiting, "everything is confirmed; the next round has a new pseudonym"};
+    patience_.wait(state_.stored(), clock_().now);
+    return {Outcome::Waiting, "waiting for the fleet to confirm what was sent under the old pseudonym"};
+}
+
+// A connection that is lost in the middle is made anew once for each batch. All that stands against an attempt is
+// looked at before each: under a pseudonym that was made anew meanwhile, nothing more may leave.
 RoundResult Round::sendAll(std::optional<Batch> waiting)
 {
     std::int64_t batches = 0;
-    while (waiting && !isForgotten_) {
+    bool isSecondAttempt = false;
+    while (waiting) {
+        keep(state_.identity().pseudonym == identity_.pseudonym);
+        if (isForgotten_)
+            break;
         if (auto reason = whyNotNow(*waiting)) {
             reason->batches = batches;
             return *std::move(reason);
         }
-        const Answer answer = putPersistently(*waiting);
-        if (!answer.isStored())
+        const Answer answer = transport_.put(waiting->messageID, waiting->bytes);
+        if (answer.isStored()) {
+            noteQueued(*waiting);
+            ++batches;
+            isSecondAttempt = false;
+            waiting = nextToSend();
+            continue;
+        }
+        state_.noteRetry(static_cast<std::int64_t>(waiting->bytes.size()), clock_().day);
+        if (answer.kind != Answer::Kind::Away || isSecondAttempt)
             return {outcomeOf(answer.kind), answer.sentence, batches};
-        noteQueued(*waiting);
-        ++batches;
-        waiting = nextToSend();
+        if (const Answer connected = connect(); !connected.isStored()) {
+            const Answer& reason = connected.kind == Answer::Kind::Away ? answer : connected;
+            return {outcomeOf(reason.kind), reason.sentence, batches};
+        }
+        isSecondAttempt = true;
     }
     if (isForgotten_)
         return {Outcome::Waiting, "the pseudonym was made anew; the next round has it", batches};
     return {Outcome::Sent, "stored", batches};
 }
 
-// A connection that is lost in the middle is made anew once: another server of a cluster goes on at once.
-Answer Round::putPersistently(const Batch& batch)
+// Another server of a cluster goes on at once.
+Answer Round::connect()
 {
-    Answer answer = transport_.put(batch.messageID, batch.bytes);
-    if (answer.kind != Answer::Kind::Away)
-        return answer;
-    state_.noteRetry(static_cast<std::int64_t>(batch.bytes.size()), clock_().day);
-    const Answer connected = transport_.connect();
-    if (!connected.isStored())
-        return connected.kind == Answer::Kind::Away ? answer : connected;
-    askForConfirmation();
-    return transport_.put(batch.messageID, batch.bytes);
+    Answer connected = transport_.connect();
+    if (connected.isStored())
+        askForConfirmation();
+    return connected;
 }
 
 void Round::noteQueued(const Batch& batch)

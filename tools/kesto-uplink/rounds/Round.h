@@ -79,10 +79,12 @@ public:
 private:
     [[nodiscard]] std::optional<Batch> nextToSend();
     [[nodiscard]] std::optional<RoundResult> whyNotNow(const Batch& batch);
-    [[nodiscard]] RoundResult sendConnected(std::optional<Batch> batch, bool isPseudonymDue);
-    [[nodiscard]] bool goesBack();
+    [[nodiscard]] Answer connect();
+    [[nodiscard]] RoundResult sendConnected(Batch batch, bool isPseudonymDue);
+    [[nodiscard]] bool goesBack(const Batch& next);
+    [[nodiscard]] bool isPatienceOver();
+    [[nodiscard]] RoundResult awaitRenewal();
     [[nodiscard]] RoundResult sendAll(std::optional<Batch> waiting);
-    [[nodiscard]] Answer putPersistently(const Batch& batch);
     void askForConfirmation();
     void awaitConfirmation();
     [[nodiscard]] bool awaitsConfirmation();

@@ -3,6 +3,8 @@
 // is overlooked.
 #include "kesto-uplink/rounds/Rounds.h"
 
+#include <sstream>
+
 namespace kesto_uplink {
 
 void runRounds(const std::function<RoundResult()>& round, Schedule& schedule, Sleep& sleep,
@@ -22,16 +24,32 @@ void runRounds(const std::function<RoundResult()>& round, Schedule& schedule, Sl
     }
 }
 
+namespace {
+
+// Servers of a list are asked in random order: which one says something is no news.
+std::string withoutServers(const std::string& sentence)
+{
+    std::istringstream words(sentence);
+    std::string rest;
+    for (std::string word; words >> word;) {
+        if (!word.contains("://"))
+            rest += word + ' ';
+    }
+    return rest;
+}
+
+} // namespace
+
 // The servers of a list are away in turn, and the bytes of a day are others each day: there only the kind matters.
 std::optional<std::string> Diary::line(const RoundResult& result)
 {
     const bool isLasting =
         result.outcome == Outcome::Away || result.outcome == Outcome::Full || result.outcome == Outcome::DayUsedUp;
-    const bool isNew = result.outcome != lastOutcome_ || (!isLasting && result.sentence != last_);
+    const bool isNew = result.outcome != lastOutcome_ || (!isLasting && withoutServers(result.sentence) != last_);
     if (result.outcome == Outcome::Nothing || !isNew)
         return std::nullopt;
     lastOutcome_ = result.outcome;
-    last_ = result.sentence;
+    last_ = withoutServers(result.sentence);
     return result.sentence;
 }
 

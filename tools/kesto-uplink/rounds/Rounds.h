@@ -31,7 +31,7 @@ public:
     [[nodiscard]] std::optional<std::string> line(const RoundResult& result);
 
 private:
-    std::string last_; // that was told; empty: all was well
+    std::string last_; // that was told, without the names of servers
     Outcome lastOutcome_ = Outcome::Sent;
 };
 

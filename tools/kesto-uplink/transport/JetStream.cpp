@@ -96,11 +96,6 @@ JetStream::JetStream(Servers servers, Credentials credentials, TimeLimits limits
     std::ranges::shuffle(servers_.urls, std::mt19937(std::random_device()()));
 }
 
-JetStream::~JetStream()
-{
-    disconnect();
-}
-
 // In milliseconds.
 std::int64_t JetStream::timeFor(std::size_t bytes) const
 {
@@ -177,13 +172,16 @@ Answer JetStream::connectTo(const std::string& url)
     jsOptions contextOptions;
     jsOptions_Init(&contextOptions);
     contextOptions.Wait = limits_.answer.count();
-    jsCtx* context = nullptr;
-    if (const natsStatus streams = natsConnection_JetStream(&context, connection.get(), &contextOptions);
-        streams != NATS_OK)
+    jsCtx* madeContext = nullptr;
+    const natsStatus streams = natsConnection_JetStream(&madeContext, connection.get(), &contextOptions);
+    Context context(madeContext);
+    if (streams != NATS_OK)
         return away(fmt::format("{} has no streams: {}", url, lastError(streams)));
     const std::scoped_lock lock(mutex_);
+    if (isInterrupted_) // meanwhile
+        return interrupted();
     connection_ = std::move(connection);
-    context_.reset(context);
+    context_ = std::move(context);
     server_ = url;
     return {};
 }
@@ -196,7 +194,7 @@ Answer JetStream::connect()
         if (isInterrupted())
             return interrupted();
         Answer answer = connectTo(url);
-        if (answer.isStored())
+        if (answer.isStored() || answer.kind == Answer::Kind::Interrupted)
             return answer;
         if (!worst || answer.kind == Answer::Kind::Refused)
             worst = std::move(answer);
@@ -226,6 +224,11 @@ bool JetStream::isInterrupted()
     return isInterrupted_;
 }
 
+Answer JetStream::withoutConnection()
+{
+    return isInterrupted() ? interrupted() : away("there is no connection");
+}
+
 Answer JetStream::failure(natsStatus status, jsErrCode code)
 {
     const char* complaint = nullptr;
@@ -251,7 +254,7 @@ Answer JetStream::failure(natsStatus status, jsErrCode code)
 Answer JetStream::put(const std::string& id, std::string_view batch)
 {
     if (!connection_)
-        return away("there is no connection");
+        return withoutConnection();
     natsMsg* made = nullptr;
     natsStatus status =
         natsMsg_Create(&made, eventSubject_.c_str(), nullptr, batch.data(), static_cast<int>(batch.size()));
@@ -285,7 +288,7 @@ Answer JetStream::confirmationsFailed(natsStatus status)
 Transport::Confirmed JetStream::lastConfirmation(const std::string& device)
 {
     if (!connection_)
-        return std::unexpected(away("there is no connection"));
+        return std::unexpected(withoutConnection());
     const std::string subject = fmt::format("kesto.stored.{}.{}", credentials_.name, device);
     // First listen, then ask: what comes in between is told twice, and nothing is missed.
     natsSubscription* made = nullptr;
@@ -308,7 +311,7 @@ Transport::Confirmed JetStream::lastConfirmation(const std::string& device)
 Transport::Confirmed JetStream::awaitConfirmation(std::chrono::milliseconds limit)
 {
     if (!connection_ || !confirmations_)
-        return std::unexpected(isInterrupted() ? interrupted() : away("there is no connection"));
+        return std::unexpected(withoutConnection());
     natsMsg* received = nullptr;
     const natsStatus status = natsSubscription_NextMsg(&received, confirmations_.get(), limit.count());
     const Message message(received);

@@ -34,7 +34,6 @@ struct TimeLimits {
 class JetStream : public Transport {
 public:
     JetStream(Servers servers, Credentials credentials, TimeLimits limits = {});
-    ~JetStream() override;
 
     Answer connect() override;
     void disconnect() override;
@@ -55,6 +54,7 @@ private:
 
     [[nodiscard]] Options optionsFor(const std::string& url);
     [[nodiscard]] Answer connectTo(const std::string& url);
+    [[nodiscard]] Answer withoutConnection();
     // What the end of a call means that did not succeed.
     [[nodiscard]] Answer failure(natsStatus status, jsErrCode code);
     [[nodiscard]] Answer confirmationsFailed(natsStatus status);
@@ -69,7 +69,7 @@ private:
 
     std::mutex mutex_; // of the two below, while connections are exchanged or interrupted
     bool isInterrupted_ = false;
-    Connection connection_;
+    Connection connection_; // destroyed behind what uses it
     std::string server_; // of the connection
     Context context_;
     Subscription confirmations_;

@@ -32,7 +32,7 @@ public:
                      address_.c_str(), nullptr);
             ::_exit(127);
         }
-        for (int attempt = 0; attempt < 2000 && !std::filesystem::exists(directory_ / "bus"); ++attempt)
+        for (int attempt = 0; attempt < 6000 && !isOpen(); ++attempt)
             std::this_thread::sleep_for(std::chrono::milliseconds(5));
     }
     ~SystemBus()
@@ -44,6 +44,15 @@ public:
     SystemBus& operator=(const SystemBus&) = delete;
 
 private:
+    // The socket's file is there before the bus listens.
+    static bool isOpen()
+    {
+        sd_bus* bus = nullptr;
+        const bool isOpen = sd_bus_open_system(&bus) >= 0;
+        sd_bus_close_unref(bus);
+        return isOpen;
+    }
+
     support::TemporaryDirectory directory_;
     std::string address_;
     support::EnvironmentVariable variable_;

@@ -27,6 +27,8 @@ struct MadeUpStore {
     std::string epoch = "aa";
     std::int64_t newest = 0;
     std::int64_t silentUpTo = 0; // up to there nothing may leave
+    bool isSaved = false; // from the one before: its places count here, too
+    std::function<void()> whileItIsRead = {};
 };
 
 class MadeUpSource : public Source {
@@ -35,10 +37,12 @@ public:
 
     std::optional<Batch> next(const Cursor& after, const std::set<std::int64_t>& /*openSessions*/) override
     {
-        const std::int64_t first = (after.epoch == store_.epoch ? after.id : 0) + 1;
+        const std::int64_t first = (after.epoch == store_.epoch || store_.isSaved ? after.id : 0) + 1;
         if (first > store_.newest)
             return std::nullopt;
         const std::int64_t last = std::min(first + 9, store_.newest);
+        if (store_.whileItIsRead)
+            store_.whileItIsRead();
         Batch batch;
         batch.messageID = fmt::format("{}:{}:{}:{}", identity_.pseudonym, store_.epoch, first, last);
         batch.bytes = "ten bytes.";
@@ -77,6 +81,8 @@ protected:
         return ranges;
     }
     std::string pseudonym() { return state.identity().pseudonym; }
+    std::int64_t bytesToday() { return state.bytesSentOn(static_cast<std::int64_t>(now / (24 * hour))); }
+    void forget(const Cursor& newest) { State::openPresent(directory.path())->forget(newest, now); }
     void confirmAllAtOnce()
     {
         stream.afterStoring = [this] { stream.confirmations[pseudonym()] = {store.epoch, store.newest}; };
@@ -92,7 +98,7 @@ protected:
                 .maximumBytesADay = 1000,
                 .pseudonymDays = 90,
                 .hashKeyDays = 90,
-                .waitForConfirmation = std::chrono::milliseconds(20)};
+                .waitForConfirmation = std::chrono::seconds(10)};
     bool isMetered = false;
     bool lacksPermission = false;
     bool isInterrupted = false;
@@ -227,6 +233,39 @@ TEST_F(RoundTest, theRestGoesTomorrowWhenTheBytesOfADayAreUsedUp)
     EXPECT_THAT(ranges(), ElementsAre("aa:1:10", "aa:11:20", "aa:21:30", "aa:31:40"));
 }
 
+TEST_F(RoundTest, theBytesOfEachAttemptCountForTheDay)
+{
+    store.newest = 10;
+    stream.isFull = true;
+    EXPECT_EQ(run().outcome, Outcome::Full);
+    EXPECT_EQ(bytesToday(), 10);
+    stream.isFull = false;
+    lacksPermission = true;
+    EXPECT_EQ(run().outcome, Outcome::Refused);
+    EXPECT_EQ(bytesToday(), 20);
+    lacksPermission = false;
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    EXPECT_EQ(bytesToday(), 30);
+}
+
+TEST_F(RoundTest, aLostBatchIsNotSentAgainBeyondTheBytesOfADay)
+{
+    terms.maximumBytesADay = 35;
+    store.newest = 40;
+    stream.losesConnectionsAfter = 2;
+    EXPECT_EQ(run().outcome, Outcome::DayUsedUp);
+    EXPECT_THAT(ranges(), ElementsAre("aa:1:10", "aa:11:20"));
+    EXPECT_EQ(bytesToday(), 30);
+}
+
+TEST_F(RoundTest, aConnectionThatIsLostTwiceEndsTheRound)
+{
+    store.newest = 10;
+    stream.afterConnecting = [this] { stream.isReachable = stream.connections < 1; };
+    EXPECT_EQ(run().outcome, Outcome::Away);
+    EXPECT_EQ(bytesToday(), 10);
+}
+
 TEST_F(RoundTest, whatMayNotLeaveIsPassedWithoutAConnection)
 {
     store.newest = store.silentUpTo = 20;
@@ -284,6 +323,17 @@ TEST_F(RoundTest, whatIsNotConfirmedForADayIsSentAgain)
     EXPECT_THAT(ranges(), ElementsAre("aa:21:21", "aa:1:10", "aa:11:20", "aa:21:22", "aa:23:23"));
 }
 
+// The new store has the rows of the old one under other keys.
+TEST_F(RoundTest, whatAnotherStoreSentIsNotSentAgain)
+{
+    store.newest = 20;
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    store = {.epoch = "bb", .newest = 22, .isSaved = true};
+    now += 25 * hour;
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    EXPECT_THAT(ranges(), ElementsAre("aa:1:10", "aa:11:20", "bb:21:22"));
+}
+
 TEST_F(RoundTest, eachConfirmationGivesAnotherDay)
 {
     store.newest = 10;
@@ -313,12 +363,35 @@ TEST_F(RoundTest, serversThatTellNoConfirmationsGetNothingTwice)
 TEST_F(RoundTest, aPseudonymThatIsMadeAnewMeanwhileEndsTheRound)
 {
     store.newest = 30;
-    stream.afterStoring = [this] { State::openPresent(directory.path())->forget({"aa", 25}, now); };
+    stream.afterStoring = [this] { forget({"aa", 25}); };
     EXPECT_EQ(run().outcome, Outcome::Waiting);
     EXPECT_THAT(ranges(), ElementsAre("aa:1:10"));
     stream.afterStoring = nullptr;
     EXPECT_EQ(run().outcome, Outcome::Sent);
     EXPECT_THAT(ranges(), ElementsAre("aa:1:10", "aa:26:30"));
+}
+
+TEST_F(RoundTest, underAPseudonymThatIsForgottenWhileItConnectsNothingLeaves)
+{
+    store.newest = 10;
+    stream.afterConnecting = [this] { forget({"aa", 5}); };
+    EXPECT_EQ(run().outcome, Outcome::Waiting);
+    EXPECT_THAT(stream.messages, IsEmpty());
+    EXPECT_EQ(state.queued(), (Cursor{"aa", 5}));
+    stream.afterConnecting = nullptr;
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    EXPECT_THAT(ranges(), ElementsAre("aa:6:10"));
+}
+
+TEST_F(RoundTest, underAPseudonymThatIsForgottenWhileTheNextBatchIsMadeNothingMoreLeaves)
+{
+    store.newest = 30;
+    store.whileItIsRead = [this] {
+        if (stream.messages.size() == 1)
+            forget({"aa", 15});
+    };
+    EXPECT_EQ(run().outcome, Outcome::Waiting);
+    EXPECT_THAT(ranges(), ElementsAre("aa:1:10"));
 }
 
 TEST_F(RoundTest, aPseudonymIsRenewedWhenAllThatWasSentUnderItIsConfirmed)
@@ -352,6 +425,43 @@ TEST_F(RoundTest, whatTheStreamLostIsSentAgainUnderThePseudonymThatIsDue)
     ASSERT_FALSE(stream.messages.empty());
     for (const auto& [id, bytes] : stream.messages)
         EXPECT_THAT(id, testing::StartsWith(old));
+}
+
+TEST_F(RoundTest, aPseudonymThatIsDueWaitsADayForServersThatTellNoConfirmations)
+{
+    const std::string old = pseudonym();
+    stream.hasConfirmations = false;
+    store.newest = 10;
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    now += 91 * 24 * hour;
+    store.newest = 20;
+    const RoundResult result = run();
+    EXPECT_EQ(result.outcome, Outcome::Waiting);
+    EXPECT_THAT(result.sentence, HasSubstr("; no confirmation: no confirmations"));
+    now += 23 * hour;
+    EXPECT_EQ(run().outcome, Outcome::Waiting);
+    EXPECT_EQ(run().outcome, Outcome::Waiting);
+    now += 2 * hour;
+    EXPECT_EQ(run().outcome, Outcome::Waiting); // gives it up
+    EXPECT_EQ(pseudonym(), old);
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    ASSERT_EQ(stream.messages.size(), 2U);
+    EXPECT_EQ(stream.messages[1].first, pseudonym() + ":aa:11:20");
+    EXPECT_NE(pseudonym(), old);
+}
+
+TEST_F(RoundTest, aPseudonymThatIsDueWaitsForNobodyIfTheStreamIsEnough)
+{
+    const std::string old = pseudonym();
+    store.newest = 10;
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    terms.forgetWhen = ForgetWhen::Queued; // by a change of the configuration
+    now += 91 * 24 * hour;
+    store.newest = 20;
+    EXPECT_EQ(run().outcome, Outcome::Sent);
+    ASSERT_EQ(stream.messages.size(), 2U);
+    EXPECT_EQ(stream.messages[1].first, pseudonym() + ":aa:11:20");
+    EXPECT_NE(pseudonym(), old);
 }
 
 TEST(Patience, itIsOverAfterADayWithTheSamePlace)

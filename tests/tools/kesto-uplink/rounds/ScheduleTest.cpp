@@ -108,6 +108,18 @@ TEST(Diary, itHasWhatChangesAndNotWhatLasts)
     EXPECT_EQ(diary.line({Outcome::Sent, "stored"}), "stored");
 }
 
+// Servers are asked in random order.
+TEST(Diary, whatLastsIsToldOnceWhicheverServerSaysIt)
+{
+    Diary diary;
+    EXPECT_EQ(diary.line({Outcome::Refused, "tls://a:4222 does not accept lounge with this password"}),
+              "tls://a:4222 does not accept lounge with this password");
+    EXPECT_EQ(diary.line({Outcome::Refused, "tls://b:4222 does not accept lounge with this password"}), std::nullopt);
+    EXPECT_EQ(diary.line({Outcome::Refused, "the certificate of tls://a:4222 is not trusted"}),
+              "the certificate of tls://a:4222 is not trusted");
+    EXPECT_EQ(diary.line({Outcome::Refused, "the certificate of tls://b:4222 is not trusted"}), std::nullopt);
+}
+
 class FakeSleep : public Sleep {
 public:
     explicit FakeSleep(int naps) : naps_(naps) { }

@@ -58,8 +58,10 @@ void HoldingProxy::serve()
 {
     while (!ends_) {
         pollfd waiting{listener_, POLLIN, 0};
-        if (::poll(&waiting, 1, turn) > 0)
-            pass(::accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC));
+        if (::poll(&waiting, 1, turn) <= 0)
+            continue;
+        ++connections_;
+        pass(::accept4(listener_, nullptr, nullptr, SOCK_CLOEXEC));
     }
 }
 

@@ -21,6 +21,7 @@ public:
     [[nodiscard]] std::string url() const;
     [[nodiscard]] bool isHolding() const { return isHolding_; }
     void holdNoMore() { holds_ = false; }
+    [[nodiscard]] int connections() const { return connections_; } // so far
 
 private:
     void serve();
@@ -31,6 +32,7 @@ private:
     int port_ = 0;
     std::atomic<bool> holds_ = true;
     mutable std::atomic<bool> isHolding_ = false;
+    std::atomic<int> connections_ = 0;
     std::atomic<bool> ends_ = false;
     std::thread thread_;
 };

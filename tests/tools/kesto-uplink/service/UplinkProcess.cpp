@@ -19,7 +19,7 @@ UplinkProcess::UplinkProcess(std::filesystem::path database, const std::string& 
     writeCredentials("name = \"alpha\"\npassword = \"secret\"\nplain = true\n");
     writeConfiguration(
         fmt::format("enabled = true\nservers = [\"{}\"]\ncredentials = \"{}\"\ninterval = 0.2\nforget = \"queued\"\n"
-                    "[events.\"*\"]\n\"*\" = \"keep\"\n",
+                    "[events.\"*\"]\nnumber = \"keep\"\n",
                     server, (directory_ / "credentials.toml").native()));
 }
 

@@ -13,7 +13,8 @@ namespace uplink_test {
 // One thread. The process ends with this object, if it has not ended before.
 class UplinkProcess {
 public:
-    // Everything of the store may leave; a round comes each fifth of a second, and waits for no confirmation.
+    // All events may leave, and of their payloads "number"; a round comes each fifth of a second, and waits for no
+    // confirmation.
     UplinkProcess(std::filesystem::path database, const std::string& server);
     ~UplinkProcess();
     UplinkProcess(const UplinkProcess&) = delete;

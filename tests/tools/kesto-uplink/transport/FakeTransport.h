@@ -5,6 +5,7 @@
 #include "kesto-uplink/transport/Transport.h"
 
 #include <algorithm>
+#include <chrono>
 #include <condition_variable>
 #include <deque>
 #include <functional>
@@ -25,6 +26,7 @@ struct FakeStream {
     int connections = 0; // so far
     unsigned losesConnectionsAfter = 0; // so many batches; 0: never
     bool hasConfirmations = true;
+    std::function<void()> afterConnecting;
     std::function<void()> afterStoring; // before the device gets its answer
 };
 
@@ -38,8 +40,9 @@ public:
     // What servers would refuse.
     bool hasWrongPassword = false;
     bool lacksPermission = false;
-    // Answers nothing; `put` then waits for `interrupt`, or its time limit, which is short.
+    // Answers nothing; `put` then waits for `interrupt`, or its time limit.
     bool isFrozen = false;
+    std::chrono::milliseconds timeLimit{};
 
     Answer connect() override
     {
@@ -52,7 +55,10 @@ public:
             return {Kind::Refused, false, "wrong password: check the credentials file"};
         ++stream_.connections;
         putsOfConnection_ = 0;
-        return connected_ = true, Answer{};
+        connected_ = true;
+        if (stream_.afterConnecting)
+            stream_.afterConnecting();
+        return {};
     }
 
     void disconnect() override { connected_ = false; }
@@ -63,7 +69,7 @@ public:
             return away("there is no connection");
         if (isFrozen) {
             std::unique_lock lock(mutex_);
-            interruption_.wait_for(lock, std::chrono::milliseconds(200), [this] { return isInterrupted_; });
+            interruption_.wait_for(lock, timeLimit, [this] { return isInterrupted_; });
         }
         if (isInterrupted())
             return {Kind::Interrupted, false, {}};

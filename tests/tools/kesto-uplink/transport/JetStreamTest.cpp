@@ -3,13 +3,19 @@
 #include "tools/kesto-uplink/transport/NatsServer.h"
 
 #include "kesto-uplink/transport/JetStream.h"
+#include "platform/linux/files/FileDescriptor.h"
 #include "support/TemporaryDirectory.h"
 
 #include <fmt/format.h>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <array>
 #include <cstdlib>
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <thread>
+#include <unistd.h>
 
 namespace uplink_test {
 namespace {
@@ -23,7 +29,10 @@ using testing::HasSubstr;
 using testing::Not;
 
 const Credentials alpha{.name = "alpha", .password = "secret", .isPlain = true};
-constexpr kesto_uplink::TimeLimits limits{.connect = 2s, .answer = 400ms};
+// What must come may take long on a busy machine.
+constexpr kesto_uplink::TimeLimits limits{.connect = 10s, .answer = 10s};
+// Of calls that no server ever answers, so that they wait so long each time.
+constexpr kesto_uplink::TimeLimits limitsWithoutAnswer{.connect = 10s, .answer = 5s};
 
 // An authority, and a server's certificate for a host, as an administrator makes them.
 class Certificates {
@@ -60,6 +69,32 @@ private:
     }
 
     support::TemporaryDirectory directory_;
+};
+
+// A port on loopback where a test stands in for the server.
+class Listener {
+public:
+    Listener()
+    {
+        sockaddr_in address{};
+        address.sin_family = AF_INET;
+        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+        socklen_t size = sizeof address;
+        EXPECT_EQ(::bind(socket_.get(), reinterpret_cast<sockaddr*>(&address), size), 0);
+        EXPECT_EQ(::listen(socket_.get(), 1), 0);
+        EXPECT_EQ(::getsockname(socket_.get(), reinterpret_cast<sockaddr*>(&address), &size), 0);
+        port_ = ntohs(address.sin_port);
+    }
+
+    [[nodiscard]] std::string url() const { return fmt::format("nats://127.0.0.1:{}", port_); }
+    [[nodiscard]] platform::FileDescriptor accept() const
+    {
+        return platform::FileDescriptor(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
+    }
+
+private:
+    platform::FileDescriptor socket_{::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)};
+    int port_ = 0;
 };
 
 const std::string valid = "-days 1";
@@ -199,7 +234,7 @@ TEST(JetStream, aServerThatRefusesIsToldBeforeOneThatIsAway)
 TEST(JetStream, serversWithoutTheStreamAreAway)
 {
     NatsServer server({.hasStreams = false});
-    JetStream transport({.urls = {server.url()}}, alpha, limits);
+    JetStream transport({.urls = {server.url()}}, alpha, limitsWithoutAnswer);
     ASSERT_TRUE(transport.connect().isStored());
     const Answer answer = transport.put("a", "1");
     EXPECT_EQ(answer.kind, Answer::Kind::Away);
@@ -207,6 +242,30 @@ TEST(JetStream, serversWithoutTheStreamAreAway)
     const auto confirmation = transport.lastConfirmation("0123");
     ASSERT_FALSE(confirmation.has_value());
     EXPECT_THAT(confirmation.error().sentence, HasSubstr("KESTO_STORED"));
+}
+
+// Speaks the least that a client needs to connect.
+TEST(JetStream, anInterruptionWhileItConnectsEndsThatCallAndAllLaterOnes)
+{
+    const Listener listener;
+    JetStream transport({.urls = {listener.url()}}, alpha, limits);
+    std::jthread server([&] {
+        const platform::FileDescriptor client = listener.accept();
+        transport.interrupt();
+        const std::string greeting = "INFO {\"server_id\":\"a\",\"version\":\"2.10.0\",\"proto\":1,\"headers\":true,"
+                                     "\"max_payload\":1048576}\r\n";
+        EXPECT_EQ(::write(client.get(), greeting.data(), greeting.size()), greeting.size());
+        std::array<char, 4096> bytes{};
+        for (std::string heard; !heard.contains("PING\r\n");) {
+            const ssize_t size = ::read(client.get(), bytes.data(), bytes.size());
+            ASSERT_GT(size, 0) << heard;
+            heard.append(bytes.data(), static_cast<std::size_t>(size));
+        }
+        EXPECT_EQ(::write(client.get(), "PONG\r\n", 6), 6);
+    });
+    EXPECT_EQ(transport.connect().kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(transport.put("a", "1").kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(transport.lastConfirmation("0123").error().kind, Answer::Kind::Interrupted);
 }
 
 TEST(JetStream, aBatchThatIsLargerThanTheServerAllowsIsRefused)
@@ -222,7 +281,8 @@ TEST(JetStream, aBatchThatIsLargerThanTheServerAllowsIsRefused)
 TEST(JetStream, aSentenceOfARefusalNamesTheSubject)
 {
     const NatsServer server;
-    JetStream forger({.urls = {server.url()}}, {.name = "forger", .password = "secret", .isPlain = true}, limits);
+    JetStream forger({.urls = {server.url()}}, {.name = "forger", .password = "secret", .isPlain = true},
+                     limitsWithoutAnswer);
     ASSERT_TRUE(forger.connect().isStored());
     EXPECT_THAT(forger.put("a", "1").sentence, HasSubstr("kesto.events.forger"));
 }

@@ -6,8 +6,10 @@
 #include <csignal>
 #include <fcntl.h>
 #include <fmt/format.h>
+#include <netinet/in.h>
 #include <stdexcept>
 #include <sys/prctl.h>
+#include <sys/socket.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -15,6 +17,8 @@
 namespace uplink_test {
 
 namespace {
+
+constexpr std::int64_t patience = 30'000; // milliseconds
 
 // The key of `keyed` is made up for this test. `forger` may publish under alpha's subject only.
 constexpr const char* accounts = R"(
@@ -50,6 +54,7 @@ NatsServer::NatsServer(const Setup& setup) : hasTLS_(!setup.tls.empty())
                        fmt::format("server_name: test\nports_file_dir: \"{}\"\nmax_payload: 600KB\n"
                                    "jetstream {{ store_dir: \"{}/streams\", max_mem: 64M, max_file: 256M }}\n{}{}",
                                    path, path, hasTLS_ ? fmt::format("tls {{\n{}\n}}\n", setup.tls) : "", accounts));
+    keepPort();
     start();
     if (!setup.hasStreams)
         return;
@@ -80,6 +85,23 @@ NatsServer::~NatsServer()
     kill();
 }
 
+// The server shares the port with this socket, since both reuse addresses and this one does not listen.
+void NatsServer::keepPort()
+{
+    portKeeper_ = platform::FileDescriptor(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
+    const int yes = 1;
+    sockaddr_in address{};
+    address.sin_family = AF_INET;
+    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    socklen_t size = sizeof address;
+    const bool isKept = ::setsockopt(portKeeper_.get(), SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes) == 0
+        && ::bind(portKeeper_.get(), reinterpret_cast<sockaddr*>(&address), size) == 0
+        && ::getsockname(portKeeper_.get(), reinterpret_cast<sockaddr*>(&address), &size) == 0;
+    if (!isKept)
+        throw std::runtime_error("no port on loopback is free");
+    port_ = ntohs(address.sin_port);
+}
+
 void NatsServer::start()
 {
     const std::string configuration = directory_ / "node.conf";
@@ -98,14 +120,10 @@ void NatsServer::start()
         ::_exit(127);
     }
     const auto ports = directory_ / fmt::format("nats-server_{}.ports", process_);
-    const std::string before = "127.0.0.1:";
-    for (int attempt = 0; attempt < 2000; ++attempt) {
+    for (int attempt = 0; attempt < 6000; ++attempt) {
         std::this_thread::sleep_for(std::chrono::milliseconds(5));
-        const std::string text = support::readFile(ports);
-        if (const auto place = text.find(before); place != std::string::npos && text.contains('}')) {
-            port_ = std::stoi(text.substr(place + before.size()));
+        if (support::readFile(ports).contains('}'))
             return;
-        }
         if (::waitpid(process_, nullptr, WNOHANG) == process_)
             break;
     }
@@ -142,6 +160,7 @@ void NatsServer::asAdministrator(const std::function<void(natsConnection*, jsCtx
     natsOptions* options = nullptr;
     check(natsOptions_Create(&options), "options");
     natsOptions_SetURL(options, url().c_str());
+    natsOptions_SetTimeout(options, patience);
     natsOptions_SetUserInfo(options, "admin", "admin");
     natsOptions_SetSecure(options, hasTLS_);
     natsOptions_SkipServerVerification(options, hasTLS_);
@@ -150,7 +169,10 @@ void NatsServer::asAdministrator(const std::function<void(natsConnection*, jsCtx
     natsOptions_Destroy(options);
     check(connected, "the administrator");
     jsCtx* context = nullptr;
-    check(natsConnection_JetStream(&context, connection, nullptr), "streams");
+    jsOptions contextOptions;
+    jsOptions_Init(&contextOptions);
+    contextOptions.Wait = patience;
+    check(natsConnection_JetStream(&context, connection, &contextOptions), "streams");
     work(connection, context);
     jsCtx_Destroy(context);
     natsConnection_Destroy(connection);

@@ -1,9 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
 // A real nats-server on loopback, with the streams and accounts that a fleet has, in a directory of its own.
 //
-// It chooses its port when it starts first and keeps it, so that it comes back where its clients look for it.
+// A socket that never listens keeps its port as long as the object lives, so that it comes back where its clients look
+// for it, and no other program gets the port meanwhile.
 #pragma once
 
+#include "platform/linux/files/FileDescriptor.h"
 #include "support/TemporaryDirectory.h"
 
 #include <nats/nats.h>
@@ -54,11 +56,13 @@ public:
     [[nodiscard]] std::vector<StoredMessage> stored(); // in the stream KESTO, in order
 
 private:
+    void keepPort();
     void asAdministrator(const std::function<void(natsConnection*, jsCtx*)>& work);
 
     const support::TemporaryDirectory directory_;
     bool hasTLS_ = false;
-    int port_ = -1;
+    platform::FileDescriptor portKeeper_;
+    int port_ = 0;
     pid_t process_ = 0;
 };
 

@@ -26,6 +26,9 @@ using testing::Pair;
 
 enum class Credential { right, wrongPassword, anothersSubject };
 
+// Of the device, where an answer must come: it may take long on a busy machine.
+constexpr auto patience = 10s;
+
 const std::string device = "0123456789abcdef0123456789abcdef";
 const std::string anotherDevice = "fedcba9876543210fedcba9876543210";
 
@@ -33,7 +36,7 @@ const std::string anotherDevice = "fedcba9876543210fedcba9876543210";
 class Fleet {
 public:
     virtual ~Fleet() = default;
-    virtual std::unique_ptr<Transport> device(Credential credential) = 0;
+    virtual std::unique_ptr<Transport> device(Credential credential, std::chrono::milliseconds timeLimit) = 0;
     virtual void kill() = 0;
     virtual void start() = 0;
     virtual void freeze(Transport& transport) = 0;
@@ -45,9 +48,10 @@ public:
 
 class FakeFleet : public Fleet {
 public:
-    std::unique_ptr<Transport> device(Credential credential) override
+    std::unique_ptr<Transport> device(Credential credential, std::chrono::milliseconds timeLimit) override
     {
         auto transport = std::make_unique<FakeTransport>(stream_);
+        transport->timeLimit = timeLimit;
         transport->hasWrongPassword = credential == Credential::wrongPassword;
         transport->lacksPermission = credential == Credential::anothersSubject;
         return transport;
@@ -69,14 +73,14 @@ private:
 
 class NatsFleet : public Fleet {
 public:
-    std::unique_ptr<Transport> device(Credential credential) override
+    std::unique_ptr<Transport> device(Credential credential, std::chrono::milliseconds timeLimit) override
     {
         return std::make_unique<kesto_uplink::JetStream>(
             kesto_uplink::Servers{.urls = {server_.url()}},
             kesto_uplink::Credentials{.name = credential == Credential::anothersSubject ? "forger" : "alpha",
                                       .password = credential == Credential::wrongPassword ? "guessed" : "secret",
                                       .isPlain = true},
-            kesto_uplink::TimeLimits{.connect = 2s, .answer = 400ms});
+            kesto_uplink::TimeLimits{.connect = 10s, .answer = timeLimit});
     }
     void kill() override { server_.kill(); }
     void start() override { server_.start(); }
@@ -103,7 +107,7 @@ private:
 template <typename Side> class TransportContract : public testing::Test {
 protected:
     Side fleet;
-    std::unique_ptr<Transport> transport = fleet.device(Credential::right);
+    std::unique_ptr<Transport> transport = fleet.device(Credential::right, patience);
 };
 
 struct Names {
@@ -170,9 +174,10 @@ TYPED_TEST(TransportContract, aServerThatIsKilledInTheMiddleIsAwayAndTakesBatche
 
 TYPED_TEST(TransportContract, aServerThatDoesNotAnswerIsAway)
 {
-    ASSERT_TRUE(this->transport->connect().isStored());
-    this->fleet.freeze(*this->transport);
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Away);
+    const auto impatient = this->fleet.device(Credential::right, 400ms);
+    ASSERT_TRUE(impatient->connect().isStored());
+    this->fleet.freeze(*impatient);
+    EXPECT_EQ(impatient->put("a", "1").kind, Answer::Kind::Away);
 }
 
 TYPED_TEST(TransportContract, aFullStreamTakesNothingAndLaterTakesTheSameBatch)
@@ -190,14 +195,14 @@ TYPED_TEST(TransportContract, aFullStreamTakesNothingAndLaterTakesTheSameBatch)
 
 TYPED_TEST(TransportContract, aWrongPasswordIsRefused)
 {
-    const Answer answer = this->fleet.device(Credential::wrongPassword)->connect();
+    const Answer answer = this->fleet.device(Credential::wrongPassword, patience)->connect();
     EXPECT_EQ(answer.kind, Answer::Kind::Refused);
     EXPECT_THAT(answer.sentence, HasSubstr("credentials file"));
 }
 
 TYPED_TEST(TransportContract, aNameWithoutRightsOnItsSubjectIsRefusedAndStoresNothing)
 {
-    const auto forger = this->fleet.device(Credential::anothersSubject);
+    const auto forger = this->fleet.device(Credential::anothersSubject, 5s); // no server answers it
     ASSERT_TRUE(forger->connect().isStored());
     const Answer answer = forger->put("a", "1");
     EXPECT_EQ(answer.kind, Answer::Kind::Refused);
@@ -229,16 +234,17 @@ TYPED_TEST(TransportContract, aNewConfirmationOfTheDeviceIsAwaited)
 
 TYPED_TEST(TransportContract, anInterruptionEndsACallThatWaitsAndAllLaterOnes)
 {
-    ASSERT_TRUE(this->transport->connect().isStored());
-    this->fleet.freeze(*this->transport);
+    const auto patient = this->fleet.device(Credential::right, 1h);
+    ASSERT_TRUE(patient->connect().isStored());
+    this->fleet.freeze(*patient);
     std::jthread interrupter([&] {
         std::this_thread::sleep_for(50ms);
-        this->transport->interrupt();
+        patient->interrupt();
     });
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Interrupted);
-    EXPECT_EQ(this->transport->put("a", "1").kind, Answer::Kind::Interrupted);
-    EXPECT_EQ(this->transport->awaitConfirmation(1h).error().kind, Answer::Kind::Interrupted);
-    EXPECT_EQ(this->transport->connect().kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(patient->put("a", "1").kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(patient->put("a", "1").kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(patient->awaitConfirmation(1h).error().kind, Answer::Kind::Interrupted);
+    EXPECT_EQ(patient->connect().kind, Answer::Kind::Interrupted);
 }
 
 } // namespace
