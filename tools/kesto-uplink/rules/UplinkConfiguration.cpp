@@ -29,10 +29,13 @@ namespace {
 
 constexpr double longestInterval = 7.0 * 86'400;
 
-bool readText(const Value& value, std::string& setting)
+// Receivers write a label into each row.
+constexpr std::size_t longestLabel = 128;
+
+bool readLabel(const Value& value, std::string& setting)
 {
     setting = value.stringView();
-    return !setting.empty() && setting.size() <= longestText;
+    return !setting.empty() && setting.size() <= longestLabel;
 }
 
 bool readPath(const Value& value, std::filesystem::path& setting)
@@ -89,10 +92,10 @@ constexpr Setting<UplinkConfiguration> settings[] = {
 constexpr std::array<std::string_view, 4> tables = {"device", "events", "stretches", "sessions"};
 
 constexpr Setting<UplinkConfiguration> labels[] = {
-    {"model", "a text of 1 to 16384 bytes",
-     [](const Value& value, UplinkConfiguration& to) { return readText(value, to.model); }},
-    {"version", "a text of 1 to 16384 bytes",
-     [](const Value& value, UplinkConfiguration& to) { return readText(value, to.version); }}};
+    {"model", "a text of 1 to 128 bytes",
+     [](const Value& value, UplinkConfiguration& to) { return readLabel(value, to.model); }},
+    {"version", "a text of 1 to 128 bytes",
+     [](const Value& value, UplinkConfiguration& to) { return readLabel(value, to.version); }}};
 
 auto keysOf(std::span<const Setting<UplinkConfiguration>> of)
 {

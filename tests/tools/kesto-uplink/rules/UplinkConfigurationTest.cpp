@@ -142,7 +142,7 @@ TEST(UplinkConfiguration, SaysWhatAValueShouldBe)
     EXPECT_THAT(problems("pseudonym_days = true"), SizeIs(1));
     EXPECT_THAT(problems("events = 1"), SizeIs(1));
     EXPECT_THAT(problems("[device]\nmodel = \"\"\n"),
-                ElementsAre("/etc/kesto/uplink.toml:2: model =  should be a text of 1 to 16384 bytes"));
+                ElementsAre("/etc/kesto/uplink.toml:2: model =  should be a text of 1 to 128 bytes"));
     EXPECT_THAT(problems("[device]\nversion = \"" + std::string(16'385, 'v') + "\"\n"), SizeIs(1));
     EXPECT_THAT(problems("[device]\nversion = \"" + std::string(16'384, 'v') + "\"\n"), IsEmpty());
 }
