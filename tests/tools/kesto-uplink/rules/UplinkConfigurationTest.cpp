@@ -143,8 +143,8 @@ TEST(UplinkConfiguration, SaysWhatAValueShouldBe)
     EXPECT_THAT(problems("events = 1"), SizeIs(1));
     EXPECT_THAT(problems("[device]\nmodel = \"\"\n"),
                 ElementsAre("/etc/kesto/uplink.toml:2: model =  should be a text of 1 to 128 bytes"));
-    EXPECT_THAT(problems("[device]\nversion = \"" + std::string(16'385, 'v') + "\"\n"), SizeIs(1));
-    EXPECT_THAT(problems("[device]\nversion = \"" + std::string(16'384, 'v') + "\"\n"), IsEmpty());
+    EXPECT_THAT(problems("[device]\nversion = \"" + std::string(129, 'v') + "\"\n"), SizeIs(1));
+    EXPECT_THAT(problems("[device]\nversion = \"" + std::string(128, 'v') + "\"\n"), IsEmpty());
 }
 
 TEST(UplinkConfiguration, SaysWhatARuleIs)
