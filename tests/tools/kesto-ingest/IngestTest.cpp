@@ -259,7 +259,7 @@ TEST_F(IngestTest, DividesRowsOfManyWeeks)
     send(text);
     turns(2);
     EXPECT_THAT(database.tables["events"], SizeIs(60));
-    EXPECT_THAT(database.blocks, SizeIs(3)) << "50 weeks, 10 weeks, and the batch";
+    EXPECT_THAT(database.blocks, SizeIs(3)) << "49 weeks, 11 weeks, and the batch";
 }
 
 TEST(Metrics, AreTextForPrometheus)
