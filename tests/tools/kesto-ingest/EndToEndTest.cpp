@@ -133,7 +133,7 @@ protected:
         return {.servers = {stream.address()},
                 .user = name,
                 .password = name,
-                .timeLimit = std::chrono::milliseconds{20'000}};
+                .timeLimit = std::chrono::milliseconds{10'000}};
     }
     [[nodiscard]] std::string configuration(const std::string& name, const std::string& databaseAddress)
     {
