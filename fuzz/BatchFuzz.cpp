@@ -31,6 +31,7 @@ void check(const std::expected<kesto_ingest::Batch, std::string>& batch)
         document.Parse<rapidjson::kParseValidateEncodingFlag>(row.json.data(), row.json.size());
         require(document.IsObject() && document.HasMember("device") && document["device"].GetString() == batch->device);
     }
+    require(batch->badRows.size() <= kesto_ingest::mostBadRows);
     for (const kesto_ingest::BadRow& row : batch->badRows)
         require(!row.reason.empty());
 }

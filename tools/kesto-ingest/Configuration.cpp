@@ -127,9 +127,9 @@ constexpr Setting settings[] = {
      [](const Value& value, Reading& reading) {
          return readNumber(value, 0.01, 30, 1000, reading.configuration.longestJoining);
      }},
-    {"metrics", "port", "a number from 1 to 65535",
+    {"metrics", "port", "a number from 0 to 65535",
      [](const Value& value, Reading& reading) {
-         return readNumber(value, 1, 65535, 1, reading.configuration.metricsPort);
+         return readNumber(value, 0, 65535, 1, reading.configuration.metricsPort);
      }},
 };
 

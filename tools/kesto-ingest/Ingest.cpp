@@ -9,6 +9,7 @@
 #include <fmt/format.h>
 
 #include <algorithm>
+#include <iterator>
 #include <utility>
 
 namespace kesto_ingest {
@@ -18,6 +19,9 @@ namespace {
 constexpr std::string_view knownEdition = "1";
 constexpr std::size_t mostFetched = 8; // batches, of which each may become large
 constexpr std::chrono::milliseconds longestWait{1000};
+constexpr std::chrono::milliseconds shortestWait{1};
+constexpr std::chrono::minutes rememberGivenBack{1}; // then another copy has it
+constexpr std::size_t mostGivenBack = 10'000;
 constexpr std::chrono::seconds holdOnEvery{10}; // of the 60 that the stream waits
 
 Counter storedRows(Table table)
@@ -36,7 +40,7 @@ Ingest::Ingest(Stream& stream, Database& database, Metrics& metrics, IngestLimit
       limits_(limits),
       surroundings_(std::move(surroundings)),
       owners_(stream),
-      confirmations_(stream)
+      confirmations_(stream, [this] { holdOn(); })
 {
 }
 
@@ -46,7 +50,7 @@ void Ingest::turn()
     const auto now = surroundings_.now();
     if (nextAttempt_ && now < *nextAttempt_) // nothing more is taken meanwhile: other copies may have more luck
         surroundings_.rest(std::min(longestWait, std::chrono::ceil<std::chrono::milliseconds>(*nextAttempt_ - now)));
-    else if (!nextAttempt_ && !isDue())
+    else if (held_.empty() || (!nextAttempt_ && !isDue()))
         takeWhatComes();
     else if (auto stored = store(); stored)
         succeed();
@@ -56,10 +60,22 @@ void Ingest::turn()
 
 void Ingest::takeWhatComes()
 {
+    if (fetched_.empty())
+        fetch();
+    while (!fetched_.empty() && !isFull()) {
+        Delivery delivery = std::move(fetched_.front());
+        fetched_.pop_front();
+        take(std::move(delivery));
+        holdOn();
+    }
+}
+
+void Ingest::fetch()
+{
     auto wait = longestWait;
     if (!held_.empty())
-        wait = std::min(wait,
-                        std::chrono::ceil<std::chrono::milliseconds>(oldest_ + limits_.joining - surroundings_.now()));
+        wait = std::clamp(std::chrono::ceil<std::chrono::milliseconds>(oldest_ + limits_.joining - surroundings_.now()),
+                          shortestWait, longestWait);
     // The first comes at once; the stream gives several together, and may wait for the last of them.
     auto deliveries = stream_.fetch(held_.empty() ? 1 : mostFetched, wait);
     metrics_.isStreamUp = deliveries.has_value();
@@ -67,12 +83,18 @@ void Ingest::takeWhatComes()
         metrics_.add(Counter::StreamFailures);
         return fail(deliveries.error());
     }
-    for (Delivery& delivery : *deliveries)
-        take(std::move(delivery));
+    if (nextAttempt_)
+        succeed();
+    if (held_.empty())
+        oldest_ = heldOn_ = surroundings_.now();
+    std::ranges::move(*deliveries, std::back_inserter(fetched_));
 }
 
 void Ingest::finish()
 {
+    for (const Delivery& delivery : fetched_)
+        stream_.giveBack(delivery);
+    fetched_.clear();
     const auto stored = store();
     if (stored)
         return;
@@ -84,23 +106,50 @@ void Ingest::finish()
 void Ingest::holdOn()
 {
     const auto now = surroundings_.now();
-    if (held_.empty() || now - heldOn_ < holdOnEvery)
+    if ((held_.empty() && fetched_.empty()) || now - heldOn_ < holdOnEvery)
         return;
     heldOn_ = now;
+    for (const Delivery& delivery : fetched_)
+        stream_.workGoesOn(delivery);
     for (const Held& held : held_)
         stream_.workGoesOn(held.delivery);
 }
 
 bool Ingest::isDue() const
 {
-    return !held_.empty()
-        && (rows_ >= limits_.rows || bytes_ >= limits_.bytes || surroundings_.now() - oldest_ >= limits_.joining);
+    return !held_.empty() && (isFull() || surroundings_.now() - oldest_ >= limits_.joining);
+}
+
+bool Ingest::isFull() const
+{
+    return rows_ >= limits_.rows || bytes_ >= limits_.bytes;
+}
+
+// A device that is told of a batch forgets what is in the earlier ones, too.
+bool Ingest::mustWaitForAnEarlierOne(const Delivery& delivery, const std::string& device)
+{
+    const auto earlier = givenBack_.find(device);
+    if (earlier == givenBack_.end())
+        return false;
+    if (delivery.sequence > earlier->second.sequence && surroundings_.now() - earlier->second.time < rememberGivenBack)
+        return true;
+    givenBack_.erase(earlier);
+    return false;
+}
+
+void Ingest::giveBack(const Delivery& delivery, const std::string& device)
+{
+    if (givenBack_.size() >= mostGivenBack)
+        givenBack_.clear();
+    givenBack_[device] = {delivery.sequence, surroundings_.now()};
+    stream_.giveBack(delivery);
 }
 
 void Ingest::refuse(Delivery& delivery, Counter counter, std::string reason)
 {
     metrics_.add(counter);
     surroundings_.log(fmt::format("the batch {} of {} is put aside: {}", delivery.sequence, delivery.subject, reason));
+    bytes_ += delivery.payload.size();
     held_.push_back({.delivery = std::move(delivery), .refusal = std::move(reason)});
 }
 
@@ -110,8 +159,6 @@ void Ingest::take(Delivery delivery)
     metrics_.add(Counter::BytesTaken, delivery.payload.size());
     if (delivery.isRepeated)
         metrics_.add(Counter::BatchesRepeated);
-    if (held_.empty())
-        oldest_ = heldOn_ = surroundings_.now();
     const std::string credential = credentialOf(delivery.subject);
     if (credential.empty())
         return refuse(delivery, Counter::BatchesRefusedUnreadable,
@@ -123,22 +170,25 @@ void Ingest::take(Delivery delivery)
     auto batch = readBatch(delivery.payload);
     if (!batch)
         return refuse(delivery, Counter::BatchesRefusedUnreadable, batch.error());
+    if (mustWaitForAnEarlierOne(delivery, batch->device))
+        return stream_.giveBack(delivery);
     const auto owner = owners_.claim(batch->device, credential);
     if (!owner) {
         metrics_.add(Counter::StreamFailures);
         surroundings_.log(owner.error());
-        return stream_.giveBack(delivery);
+        return giveBack(delivery, batch->device);
     }
     if (*owner != credential)
         return refuse(delivery, Counter::BatchesRefusedForged,
                       fmt::format("its pseudonym {} belongs to the credential {}", batch->device, *owner));
     metrics_.add(Counter::RowsRefusedSchema, batch->badRows.size());
     for (const BadRow& row : batch->badRows)
-        bytes_ += row.line.size();
+        bytes_ += sizeof(BadRow) + row.reason.size() + row.line.size();
     const std::size_t source = held_.size();
-    held_.push_back({.delivery = std::move(delivery),
-                     .badRows = std::move(batch->badRows),
-                     .confirmation = {credential, batch->device, batch->epoch, batch->last}});
+    bytes_ += delivery.payload.size();
+    const Confirmation confirmation = {credential, batch->device, batch->epoch, batch->last, delivery.isRepeated};
+    held_.push_back(
+        {.delivery = std::move(delivery), .badRows = std::move(batch->badRows), .confirmation = confirmation});
     for (const Row& row : batch->rows)
         addRow(row, source);
     metrics_.waitingRows = rows_;
@@ -170,12 +220,15 @@ std::expected<void, std::string> Ingest::storeBlocks()
         for (const RefusedRow& row : *refused)
             held_[next.block.source(row.row)].badRows.push_back(
                 {row.reason, std::string(next.block.rows(row.row, row.row + 1))});
-        metrics_.lastStored =
-            std::chrono::duration_cast<std::chrono::seconds>(std::chrono::system_clock::now().time_since_epoch())
-                .count();
+        if (refused->size() < next.block.size())
+            metrics_.lastStored =
+                std::chrono::duration_cast<std::chrono::seconds>(std::chrono::system_clock::now().time_since_epoch())
+                    .count();
         metrics_.add(Counter::Inserts);
         metrics_.add(Counter::RowsRefusedDatabase, refused->size());
         metrics_.add(storedRows(next.table), next.block.size() - refused->size());
+        rows_ -= next.block.size();
+        metrics_.waitingRows = rows_;
         blocks_.pop_back();
     }
     return {};
@@ -189,10 +242,16 @@ std::expected<void, std::string> Ingest::putAside(Held& held)
     dead.reserve(held.badRows.size());
     for (const BadRow& row : held.badRows)
         dead.push_back({row.reason, row.line});
-    auto put = held.refusal.empty() ? putRowsAside(stream_, held.delivery, dead)
-                                    : putBatchAside(stream_, held.delivery, held.refusal);
-    held.isPutAside = put.has_value();
-    return put;
+    const auto lost = held.refusal.empty() ? putRowsAside(stream_, held.delivery, dead, [this] { holdOn(); })
+                                           : putBatchAside(stream_, held.delivery, held.refusal);
+    if (!lost)
+        return std::unexpected(lost.error());
+    held.isPutAside = true;
+    metrics_.add(Counter::LettersLost, *lost);
+    if (*lost > 0)
+        surroundings_.log(fmt::format("{} dead letters of the batch {} of {} are too large for the stream {}, and lost",
+                                      *lost, held.delivery.sequence, held.delivery.subject, deadStream));
+    return {};
 }
 
 std::expected<void, std::string> Ingest::tellDevices()
@@ -222,9 +281,11 @@ std::expected<void, std::string> Ingest::store()
 
 std::expected<void, std::string> Ingest::answer()
 {
-    for (Held& held : held_)
+    for (Held& held : held_) {
         if (auto put = putAside(held); !put)
             return put;
+        holdOn();
+    }
     if (auto told = tellDevices(); !told)
         return told;
     for (const Held& held : held_)

@@ -15,10 +15,13 @@
 #include <array>
 #include <chrono>
 #include <cstddef>
+#include <cstdint>
+#include <deque>
 #include <expected>
 #include <functional>
 #include <optional>
 #include <string>
+#include <unordered_map>
 #include <vector>
 
 namespace kesto_ingest {
@@ -66,6 +69,10 @@ private:
     };
 
     void takeWhatComes();
+    void fetch();
+    [[nodiscard]] bool isFull() const;
+    [[nodiscard]] bool mustWaitForAnEarlierOne(const Delivery& delivery, const std::string& device);
+    void giveBack(const Delivery& delivery, const std::string& device);
     void take(Delivery delivery);
     void refuse(Delivery& delivery, Counter counter, std::string reason);
     void addRow(const Row& row, std::size_t source);
@@ -86,11 +93,18 @@ private:
     Owners owners_;
     Confirmations confirmations_;
 
+    struct GivenBack {
+        std::uint64_t sequence;
+        Clock::time_point time;
+    };
+
+    std::deque<Delivery> fetched_; // and not taken
+    std::unordered_map<std::string, GivenBack> givenBack_; // by device: the first of its batches, for a time
     std::vector<Held> held_;
     std::vector<TableBlock> blocks_; // not stored
     std::size_t rows_ = 0; // in these
     std::size_t bytes_ = 0;
-    Clock::time_point oldest_; // when the first of `held_` came
+    Clock::time_point oldest_; // when the first of `fetched_` and `held_` came
     Clock::time_point heldOn_; // when the stream was told last
     std::optional<Clock::time_point> nextAttempt_; // after a failure
     std::chrono::milliseconds pause_{0};

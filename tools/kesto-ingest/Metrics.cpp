@@ -30,6 +30,7 @@ constexpr std::array<MetricRow, static_cast<std::size_t>(Counter::Count)> rows =
     MetricRow{"kesto_ingest_rows_stored_total", "{table=\"sessions\"}", ""},
     MetricRow{"kesto_ingest_rows_refused_total", "{reason=\"schema\"}", "Rows that were put aside."},
     MetricRow{"kesto_ingest_rows_refused_total", "{reason=\"database\"}", ""},
+    MetricRow{"kesto_ingest_letters_lost_total", "", "Dead letters that the stream refused for their size."},
     MetricRow{"kesto_ingest_taken_bytes_total", "", "Compressed bytes that came from the stream."},
     MetricRow{"kesto_ingest_inserts_total", "", "Blocks that the database has taken."},
     MetricRow{"kesto_ingest_insert_failures_total", "", "Attempts to store that failed; each is repeated."},

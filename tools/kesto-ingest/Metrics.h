@@ -21,6 +21,7 @@ enum class Counter : std::uint8_t {
     RowsStoredSessions,
     RowsRefusedSchema,
     RowsRefusedDatabase,
+    LettersLost,
     BytesTaken,
     Inserts,
     InsertFailures,

@@ -82,7 +82,7 @@ TEST_F(IngestConfiguration, NamesWhatIsWrong)
               "there is no [rows]; the tables are [stream], [database], [batches] and [metrics]");
     EXPECT_EQ(problem("[batches]\nrow = 7\n"), "unknown key row in [batches]; the keys are rows, seconds");
     EXPECT_EQ(problem("[batches]\nrows = 0\n"), "batches.rows = 0 should be a number from 1 to 100000");
-    EXPECT_EQ(problem("[metrics]\nport = true\n"), "metrics.port = 1 should be a number from 1 to 65535");
+    EXPECT_EQ(problem("[metrics]\nport = true\n"), "metrics.port = 1 should be a number from 0 to 65535");
     EXPECT_EQ(problem("[stream]\nservers = []\n"),
               R"(stream.servers = [] should be a list such as ["nats://127.0.0.1:4222"])");
     EXPECT_EQ(problem("[database]\nservers = [\"ftp://a\"]\n"),

@@ -13,13 +13,10 @@
 
 namespace kesto_ingest {
 
-// A port of 127.0.0.1 that nobody uses now.
-[[nodiscard]] std::uint16_t freePort();
-
-// The body of the answer; empty if there is none. A question with a body is a POST.
+// The body of the answer; "no answer: " and the reason if there is none. A question with a body is a POST.
 [[nodiscard]] std::string ask(const std::string& address, const std::string& body = {});
 
-// Fails the test if the condition does not hold in time.
+// Throws if the condition does not hold in time.
 void waitUntil(const std::string& what, const std::function<bool()>& holds);
 
 // Ends with the test, even if that is killed.
@@ -27,18 +24,19 @@ class NatsServer {
 public:
     explicit NatsServer(const std::filesystem::path& directory);
 
+    void end(); // at once
     [[nodiscard]] std::string address() const { return "nats://127.0.0.1:" + std::to_string(port_); }
 
 private:
-    std::uint16_t port_ = freePort();
     std::unique_ptr<sdk_test::Process> process_;
+    std::uint16_t port_ = 0;
 };
 
 class ClickHouseServer {
 public:
     explicit ClickHouseServer(std::filesystem::path directory);
 
-    void start();
+    void start(); // perhaps on another port than before
     void end(); // at once, without a chance to finish
     void makeTables() const;
     [[nodiscard]] std::string address() const { return "http://127.0.0.1:" + std::to_string(port_); }
@@ -47,9 +45,10 @@ public:
     [[nodiscard]] std::string select(const std::string& query) const;
 
 private:
+    [[nodiscard]] bool isReady() const;
+
     std::filesystem::path directory_;
-    std::uint16_t port_ = freePort();
-    std::uint16_t tcpPort_ = freePort();
+    std::uint16_t port_ = 0;
     std::unique_ptr<sdk_test::Process> process_;
 };
 

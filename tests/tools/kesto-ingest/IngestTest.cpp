@@ -202,6 +202,88 @@ TEST_F(IngestTest, AcknowledgesNothingWhoseDeadLetterCannotBePutAside)
     EXPECT_THAT(database.tables["events"], SizeIs(1)) << "what is stored is not stored again";
 }
 
+TEST_F(IngestTest, AcknowledgesNothingWhoseDeviceCannotBeTold)
+{
+    send(deviceLine(1, 9) + eventLine(3));
+    turns(1);
+    stream.takesNoPut = true;
+    turns(1);
+    EXPECT_THAT(database.tables["events"], SizeIs(1));
+    EXPECT_EQ(metrics.waitingRows.load(), 0U) << "they are stored";
+    EXPECT_EQ(stream.unacknowledged(), 1U);
+    EXPECT_EQ(metrics.count(Counter::BatchesStored), 0U);
+    stream.takesNoPut = false;
+    turns(2);
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+    EXPECT_EQ(metrics.count(Counter::BatchesStored), 1U);
+}
+
+TEST_F(IngestTest, GoesOnAfterALetterThatIsTooLarge)
+{
+    stream.largestLetter = 4;
+    stream.send("kesto.events.one", "nonsense");
+    turns(2);
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+    EXPECT_EQ(metrics.count(Counter::LettersLost), 1U);
+    EXPECT_THAT(lines,
+                Contains("1 dead letters of the batch 1 of kesto.events.one are too large for the stream "
+                         "KESTO_DEAD, and lost"));
+}
+
+TEST_F(IngestTest, StoresNoBatchOfADeviceBeforeAnEarlierOneThatItGaveBack)
+{
+    ingest = makeIngest({.joining = milliseconds{1000}});
+    send(deviceLine(1, 1, deviceB) + eventLine(1, deviceB), "two");
+    turns(1); // the next fetch brings several
+    stream.takesNoPut = true;
+    send(deviceLine(1, 3) + eventLine(1));
+    turns(1); // its owner cannot be asked, so it goes back, behind the next
+    stream.takesNoPut = false;
+    send(deviceLine(4, 6) + eventLine(4));
+    send(deviceLine(7, 9) + eventLine(7));
+    stream.rotate();
+    turns(1);
+    EXPECT_EQ(stream.unacknowledged(), 4U);
+    now += milliseconds{1000};
+    turns(1);
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":3})");
+    now += milliseconds{1000};
+    turns(4);
+    now += milliseconds{1000};
+    turns(4);
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":9})");
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+}
+
+TEST_F(IngestTest, AFailureOfTheStreamEndsWithTheNextFetch)
+{
+    stream.isAway = true;
+    turns(1 + 2 * 2);
+    EXPECT_THAT(rested, ElementsAre(500, 1000)) << "each failure makes the pause longer";
+}
+
+TEST_F(IngestTest, TellsTheStreamThatItWorksOnWhatItHasNotTaken)
+{
+    ingest = makeIngest({.rows = 1, .joining = milliseconds{1000}});
+    database.isAway = true;
+    stream.send("kesto.events.one", "nonsense"); // no row
+    turns(1);
+    for (int batch = 1; batch <= 3; ++batch)
+        send(deviceLine(batch, batch) + eventLine(batch));
+    turns(2);
+    EXPECT_EQ(metrics.count(Counter::BatchesTaken), 2U) << "two rows are enough";
+    now += std::chrono::seconds(11);
+    ingest->holdOn();
+    EXPECT_EQ(stream.toldThatWorkGoesOn, 4) << "two that are taken, and two that are not";
+    ingest->finish();
+    stream.forgetTaken();
+    database.isAway = false;
+    ingest = makeIngest();
+    turns(10);
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+    EXPECT_THAT(database.tables["events"], SizeIs(3));
+}
+
 TEST_F(IngestTest, WaitsForTheStream)
 {
     stream.isAway = true;
@@ -259,7 +341,7 @@ TEST_F(IngestTest, DividesRowsOfManyWeeks)
     send(text);
     turns(2);
     EXPECT_THAT(database.tables["events"], SizeIs(60));
-    EXPECT_THAT(database.blocks, SizeIs(3)) << "50 weeks, 10 weeks, and the batch";
+    EXPECT_THAT(database.blocks, SizeIs(3)) << "49 weeks, 11 weeks, and the batch";
 }
 
 TEST(Metrics, AreTextForPrometheus)

@@ -51,6 +51,7 @@ void appendColumn(const Field& field, const RowReader& row, std::string& json)
     case FieldType::Count: json += entry->text; break;
     case FieldType::Flag: json += entry->kind == ValueKind::True ? '1' : '0'; break;
     case FieldType::Digits:
+    case FieldType::Label:
     case FieldType::Text:
     case FieldType::Object: appendText(entry->text, json); break;
     }
@@ -70,8 +71,8 @@ public:
             if (!isBegun_) {
                 if (auto begun = begin(line); !begun)
                     return std::unexpected(begun.error());
-            } else
-                add(line);
+            } else if (auto added = add(line); !added)
+                return std::unexpected(added.error());
         }
         if (!isBegun_)
             return std::unexpected("it is empty");
@@ -100,7 +101,8 @@ private:
         return {};
     }
 
-    void add(std::string_view line)
+    // A few compressed bytes can become many rows, so what becomes of them has bounds.
+    std::expected<void, std::string> add(std::string_view line)
     {
         if (auto read = row_.read(line); !read)
             batch_.badRows.push_back({read.error(), std::string(line)});
@@ -110,25 +112,32 @@ private:
             batch_.badRows.push_back({"the first row is of another device or epoch", std::string(line)});
         else
             addRow(labels_);
+        if (batch_.badRows.size() > mostBadRows)
+            return std::unexpected(fmt::format("more than {} of its rows are wrong; of the first, {}", mostBadRows,
+                                               batch_.badRows.front().reason));
+        if (written_ > largestRows)
+            return std::unexpected(fmt::format("its rows become more than {} bytes", largestRows));
+        return {};
     }
 
     void addRow(std::string_view labels)
     {
         constexpr double secondsOfWeek = 7 * 86400;
-        constexpr std::size_t usualRow = 768;
+        constexpr double beforeThursday = 3 * 86400; // 1970 began on one
         Row& row = batch_.rows.emplace_back();
         row.table = row_.kind().table;
-        row.week = static_cast<std::uint32_t>(row_.number(row_.kind().week) / secondsOfWeek);
-        row.json.reserve(usualRow);
+        row.week = static_cast<std::uint32_t>((row_.number(row_.kind().week) + beforeThursday) / secondsOfWeek);
         for (const Field& field : row_.kind().fields)
             appendColumn(field, row_, row.json);
         row.json += labels;
         row.json += "}\n";
+        written_ += row.json.size();
     }
 
     RowReader row_;
     Batch batch_;
     bool isBegun_ = false;
+    std::size_t written_ = 0; // bytes of rows
     std::string labels_;
 };
 

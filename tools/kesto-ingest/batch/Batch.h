@@ -19,10 +19,12 @@ namespace kesto_ingest {
 
 constexpr std::size_t largestBatch = 512 * 1024; // compressed
 constexpr std::size_t largestContent = 8 * 1024 * 1024;
+constexpr std::size_t largestRows = 32 * 1024 * 1024; // as they are written for the database
+constexpr std::size_t mostBadRows = 1000;
 
 struct Row {
     Table table;
-    std::uint32_t week; // since 1970
+    std::uint32_t week; // from Monday on, as the partitions of the tables; 1970 begins in week 0
     std::string json; // a line of JSONEachRow, with its end
 };
 

@@ -24,7 +24,7 @@ namespace kesto_ingest {
 
 namespace {
 
-constexpr unsigned deepest = 16; // of objects and lists in each other
+constexpr unsigned deepest = 48; // of objects and lists in each other; devices send up to 40
 
 template <typename Number> std::optional<Number> numberIn(std::string_view text) noexcept
 {
@@ -59,6 +59,9 @@ public:
         if (isInside())
             return writer_.Key(text, length);
         const std::string_view key(text, length);
+        isIgnored_ = !hasField(key);
+        if (isIgnored_)
+            return true;
         for (const RowEntry& entry : entries_.first(size_))
             if (entry.key == key)
                 return refuse(fmt::format("the key {} is there twice", key.substr(0, 64)));
@@ -91,6 +94,8 @@ private:
     {
         if (depth_ == 0)
             return refuse("it is no JSON object");
+        if (isIgnored_)
+            return true;
         entries_[size_ - 1].kind = kind;
         entries_[size_ - 1].text = text;
         return true;
@@ -112,6 +117,7 @@ private:
     std::span<RowEntry> entries_;
     std::size_t& size_;
     unsigned depth_ = 0;
+    bool isIgnored_ = false; // the key that was read last, outside of objects and lists
     std::string reason_;
     rapidjson::StringBuffer buffer_;
     rapidjson::Writer<rapidjson::StringBuffer> writer_{buffer_};
@@ -151,6 +157,7 @@ std::string_view lacking(const RowEntry& entry, FieldType type)
     case FieldType::Number: return isNumberBetween(entry, -largest, largest) ? "" : "a number";
     case FieldType::Length: return isNumberBetween(entry, 0, largest) ? "" : "a number from 0 on";
     case FieldType::Flag: return entry.kind == ValueKind::False || entry.kind == ValueKind::True ? "" : "true or false";
+    case FieldType::Label: return isText && entry.text.size() <= longestLabel ? "" : "a text of at most 128 bytes";
     case FieldType::Text: return isText && entry.text.size() <= longestText ? "" : "a text of at most 16384 bytes";
     case FieldType::Object: return entry.kind == ValueKind::Object ? "" : "an object";
     }
@@ -179,18 +186,22 @@ std::expected<void, std::string> RowReader::parse(std::string_view line)
     return {};
 }
 
-std::expected<void, std::string> RowReader::checkFields() const
+std::expected<void, std::string> RowReader::checkFields()
 {
-    for (const RowEntry& entry : std::span(entries_).first(size_))
-        if (std::ranges::find(kind_->fields, entry.key, &Field::key) == kind_->fields.end())
-            return std::unexpected(fmt::format("a row of kind {} has no key {}", kind_->name, entry.key.substr(0, 64)));
+    const auto entries = std::span(entries_).first(size_);
     for (const Field& field : kind_->fields) {
-        const RowEntry* const entry = find(field.key);
+        const auto place = std::ranges::find(entries, field.key, &RowEntry::key);
+        RowEntry* const entry = place == entries.end() || place->kind == ValueKind::Null ? nullptr : &*place;
         if (entry == nullptr && field.isRequired)
             return std::unexpected(fmt::format("the key {} is missing", field.key));
         if (entry == nullptr)
             continue;
-        if (const std::string_view what = lacking(*entry, field.type); !what.empty())
+        const std::string_view what = lacking(*entry, field.type);
+        if (what.empty())
+            continue;
+        if (!field.isRequired)
+            entry->kind = ValueKind::Null;
+        else
             return std::unexpected(fmt::format("{} is not {}", field.key, what));
     }
     return {};

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Reads one line of a batch: a JSON object whose keys, types and bounds the schema allows.
+// Reads one line of a batch: a JSON object with the keys, types and bounds of the schema. Keys that the schema does not
+// have are ignored, because later releases of devices send more.
 //
 // Numbers stay the text that they came as, so that none loses a digit on its way.
 #pragma once
@@ -38,7 +39,7 @@ public:
 
 private:
     [[nodiscard]] std::expected<void, std::string> parse(std::string_view line);
-    [[nodiscard]] std::expected<void, std::string> checkFields() const;
+    [[nodiscard]] std::expected<void, std::string> checkFields();
 
     std::array<RowEntry, mostFields> entries_;
     std::size_t size_ = 0;

@@ -16,8 +16,8 @@ constexpr Field deviceFields[] = {
     {"device", FieldType::Digits, required, "device"},
     {"epoch", FieldType::Digits, required, "epoch"},
     {"kind", FieldType::Text, required, ""},
-    {"model", FieldType::Text, optional, "model"},
-    {"version", FieldType::Text, optional, "version"},
+    {"model", FieldType::Label, optional, "model"},
+    {"version", FieldType::Label, optional, "version"},
     {"sent", FieldType::Moment, required, "sent"},
     {"first", FieldType::Identity, required, "first_id"},
     {"last", FieldType::Identity, required, "last_id"},
@@ -85,6 +85,13 @@ const RowKind* kindNamed(std::string_view name) noexcept
 {
     const auto* const kind = std::ranges::find(kinds, name, &RowKind::name);
     return kind == kinds.end() ? nullptr : kind;
+}
+
+bool hasField(std::string_view key) noexcept
+{
+    return std::ranges::any_of(kinds, [key](const RowKind& kind) {
+        return std::ranges::find(kind.fields, key, &Field::key) != kind.fields.end();
+    });
 }
 
 } // namespace kesto_ingest

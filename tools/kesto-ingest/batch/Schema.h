@@ -18,6 +18,7 @@ enum class FieldType : std::uint8_t {
     Count, // an integer of 32 bits, not negative
     Integer, // of 64 bits
     Flag, // a boolean
+    Label, // a short text, which stands in every row of a batch
     Text,
     Object // JSON
 };
@@ -28,7 +29,7 @@ constexpr std::size_t tableCount = 4;
 struct Field {
     std::string_view key;
     FieldType type;
-    bool isRequired;
+    bool isRequired; // if not, a value that does not fit is left out
     std::string_view column; // empty: it is no column
 };
 
@@ -39,12 +40,15 @@ struct RowKind {
     std::span<const Field> fields;
 };
 
-constexpr std::size_t mostFields = 20; // of a row
+constexpr std::size_t mostFields = 32; // of all kinds together
+constexpr std::size_t longestLabel = 128;
 constexpr std::size_t longestText = 16 * 1024;
 constexpr double latestMoment = 4'294'967'295; // the end of 32 bits
 
 [[nodiscard]] std::string_view name(Table table) noexcept;
 // Null if there is none of that name.
 [[nodiscard]] const RowKind* kindNamed(std::string_view name) noexcept;
+// Of any kind.
+[[nodiscard]] bool hasField(std::string_view key) noexcept;
 
 } // namespace kesto_ingest

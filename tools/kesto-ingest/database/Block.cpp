@@ -2,6 +2,8 @@
 // Halves what the database refuses, until single rows are left.
 #include "kesto-ingest/database/Block.h"
 
+#include "kesto-ingest/database/Tables.h"
+
 #include <utility>
 
 namespace kesto_ingest {
@@ -31,6 +33,13 @@ std::expected<std::vector<RefusedRow>, std::string> insertBlock(Database& databa
         }
         if (!hasStored && refused.size() >= suspiciousRefusals)
             return std::unexpected("it refuses every row: " + refused.front().reason);
+    }
+    if (!hasStored && !refused.empty()) {
+        const auto edition = database.edition();
+        if (!edition)
+            return std::unexpected(edition.error());
+        if (*edition != tablesEdition)
+            return std::unexpected("the tables are of another edition, or not there: " + refused.front().reason);
     }
     return refused;
 }

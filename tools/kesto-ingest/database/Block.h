@@ -19,9 +19,13 @@ namespace kesto_ingest {
 
 class Block {
 public:
-    static constexpr std::size_t mostWeeks = 50;
+    static constexpr std::size_t mostWeeks = 49;
+    static constexpr std::size_t mostBytes = 16 * 1024 * 1024; // and one row
 
-    [[nodiscard]] bool takes(std::uint32_t week) const { return weeks_.size() < mostWeeks || weeks_.contains(week); }
+    [[nodiscard]] bool takes(std::uint32_t week) const
+    {
+        return text_.size() < mostBytes && (weeks_.size() < mostWeeks || weeks_.contains(week));
+    }
     // `source` tells the caller where a row came from.
     void add(std::string_view row, std::uint32_t week, std::size_t source)
     {
@@ -56,7 +60,8 @@ struct RefusedRow {
 
 // Inserts the block, and returns the rows that the database refuses; it halves the block to find them. The error says
 // why the database could not be used; a part of the block may then be stored. So it is if the database refuses
-// everything of a block with `suspiciousRefusals` rows or more: then not the rows are wrong, but the tables.
+// everything of a block with `suspiciousRefusals` rows or more, or of a smaller one if the tables are of another
+// edition: then not the rows are wrong, but the tables.
 constexpr std::size_t suspiciousRefusals = 32;
 [[nodiscard]] std::expected<std::vector<RefusedRow>, std::string>
 insertBlock(Database& database, std::string_view table, const Block& block);

@@ -94,6 +94,7 @@ ClickHouse::Answer ClickHouse::askServer(const std::string& server, const std::s
                                       connection_->escaped(query));
     for (const auto& [name, value] : configuration_.settings)
         address += fmt::format("&{}={}", connection_->escaped(name), connection_->escaped(value));
+    address += "&insert_distributed_sync=1"; // the answer says that the rows are on their shard
     Answer answer;
     std::array<char, CURL_ERROR_SIZE> error{};
     CURL* const handle = connection_->handle;

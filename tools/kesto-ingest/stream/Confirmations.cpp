@@ -46,9 +46,12 @@ std::expected<void, std::string> Confirmations::leaveOutWhatIsTold(Waiting& wait
             if (!told)
                 return std::unexpected(told.error());
             told_[subject] = *std::move(told);
+            holdOn_();
         }
         const Told& told = told_[subject];
-        next = told.epoch == confirmation->epoch && told.id >= confirmation->id ? waiting.erase(next) : std::next(next);
+        const bool isTold = told.epoch == confirmation->epoch ? told.id >= confirmation->id
+                                                              : confirmation->isRepeated && !told.epoch.empty();
+        next = isTold ? waiting.erase(next) : std::next(next);
     }
     return {};
 }
@@ -80,13 +83,18 @@ std::expected<void, std::string> Confirmations::tell(std::span<const Confirmatio
     if (told_.size() >= mostTold)
         told_.clear();
     Waiting waiting;
-    for (const Confirmation& each : confirmations)
-        waiting[fmt::format("{}{}.{}", storedPrefix, each.credential, each.device)] = &each;
+    for (const Confirmation& each : confirmations) {
+        const Confirmation*& kept = waiting[fmt::format("{}{}.{}", storedPrefix, each.credential, each.device)];
+        const bool isNewer = kept == nullptr || (kept->epoch == each.epoch ? kept->id < each.id : !each.isRepeated);
+        if (isNewer)
+            kept = &each;
+    }
     for (int attempt = 0; attempt < mostAttempts; ++attempt) {
         if (auto left = leaveOutWhatIsTold(waiting); !left || waiting.empty())
             return left;
         if (auto done = put(waiting); !done)
             return done;
+        holdOn_();
     }
     if (waiting.empty())
         return {};

@@ -6,10 +6,12 @@
 
 #include <cstdint>
 #include <expected>
+#include <functional>
 #include <map>
 #include <span>
 #include <string>
 #include <unordered_map>
+#include <utility>
 
 namespace kesto_ingest {
 
@@ -18,15 +20,22 @@ struct Confirmation {
     std::string device;
     std::string epoch;
     std::uint64_t id = 0;
+    bool isRepeated = false; // its batch came before
 };
 
 // One thread. The stream must outlive it.
 class Confirmations {
 public:
-    explicit Confirmations(Stream& stream) : stream_(stream) { }
+    // `holdOn` is called while many devices are told.
+    explicit Confirmations(
+        Stream& stream, std::function<void()> holdOn = [] { })
+        : stream_(stream),
+          holdOn_(std::move(holdOn))
+    {
+    }
 
-    // Within an epoch what is told never goes back, whatever other copies tell. The last of several for one device
-    // counts.
+    // Within an epoch what is told never goes back, whatever other copies tell. A batch that came before says nothing
+    // if another epoch is told: its own may be the older one. Of several epochs of one device the last counts.
     [[nodiscard]] std::expected<void, std::string> tell(std::span<const Confirmation> confirmations);
 
 private:
@@ -43,6 +52,7 @@ private:
     [[nodiscard]] std::expected<Told, std::string> look(const std::string& subject);
 
     Stream& stream_;
+    std::function<void()> holdOn_;
     std::unordered_map<std::string, Told> told_; // by subject
 };
 

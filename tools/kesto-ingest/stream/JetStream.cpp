@@ -38,7 +38,7 @@ constexpr std::int64_t giveBackAfter = 2000; // milliseconds
 constexpr std::int64_t rememberIdsFor = 120 * nanosecondsASecond;
 constexpr std::int64_t keepDeadFor = 90 * 86400 * nanosecondsASecond;
 constexpr std::int64_t mostUnacknowledged = 20'000;
-constexpr int largestMessage = 1000 * 1000;
+constexpr int largestMessage = 544 * 1024; // a batch, or a dead letter, and its headers
 
 std::string headerOf(natsMsg* message, const char* name)
 {
@@ -101,12 +101,20 @@ struct JetStream::Connection {
     [[nodiscard]] std::string reason(std::string_view what, natsStatus status)
     {
         std::string text = fmt::format("{}: {}", what, natsStatus_GetText(status));
-        if (const char* const detail = nats_GetLastError(nullptr); detail != nullptr && *detail != 0)
+        natsStatus last = NATS_OK; // of this thread; it may be older
+        if (const char* const detail = nats_GetLastError(&last); last == status && detail != nullptr && *detail != 0)
             text += fmt::format(" ({})", detail);
         const std::scoped_lock lock(words.mutex);
         if (!words.text.empty())
             text += fmt::format("; the server said: {}", std::exchange(words.text, {}));
         return text;
+    }
+
+    // No batch is no sign of a broken connection, but the two look alike.
+    [[nodiscard]] bool isUp()
+    {
+        const std::scoped_lock lock(words.mutex);
+        return words.text.empty() && natsConnection_Status(connection.get()) == NATS_CONN_STATUS_CONNECTED;
     }
 
     [[nodiscard]] std::expected<void, std::string> subscribe()
@@ -164,10 +172,12 @@ JetStream::JetStream(const JetStreamConfiguration& configuration) : connection_(
         set(natsOptions_SetNKeyFromSeed, made, configuration.nkey.c_str(), configuration.nkeySeedFile.c_str());
     if (!configuration.user.empty())
         set(natsOptions_SetUserInfo, made, configuration.user.c_str(), configuration.password.c_str());
-    if (!configuration.certificateAuthority.empty()) {
-        set(natsOptions_SetSecure, made, true);
+    const bool asksForTLS = std::ranges::any_of(configuration.servers,
+                                                [](const std::string& server) { return server.starts_with("tls://"); });
+    if (asksForTLS || !configuration.certificateAuthority.empty())
+        set(natsOptions_SetSecure, made, true); // for all servers
+    if (!configuration.certificateAuthority.empty())
         set(natsOptions_LoadCATrustedCertificates, made, configuration.certificateAuthority.c_str());
-    }
     natsConnection* connection = nullptr;
     set(natsConnection_Connect, &connection, made);
     connection_->connection.reset(connection);
@@ -226,9 +236,13 @@ std::expected<void, std::string> JetStream::setUp(const StreamSizes& sizes)
         stream.Replicas = sizes.replicas;
         wanted.shape(stream, sizes);
         jsErrCode code{};
-        natsStatus status = js_AddStream(nullptr, context, &stream, nullptr, &code);
-        if (status != NATS_OK && code == JSStreamNameExistErr)
+        jsStreamInfo* info = nullptr;
+        natsStatus status = js_GetStreamInfo(&info, context, wanted.name, nullptr, &code);
+        jsStreamInfo_Destroy(info);
+        if (status == NATS_OK)
             status = js_UpdateStream(nullptr, context, &stream, nullptr, &code);
+        else if (code == JSStreamNotFoundErr)
+            status = js_AddStream(nullptr, context, &stream, nullptr, &code);
         if (status != NATS_OK)
             return std::unexpected(
                 connection_->reason(fmt::format("the stream {} cannot be made", wanted.name), status));
@@ -255,7 +269,7 @@ std::expected<std::vector<Delivery>, std::string> JetStream::fetch(std::size_t m
     jsErrCode code{};
     const natsStatus status =
         natsSubscription_Fetch(&list, connection_->subscription.get(), static_cast<int>(most), wait.count(), &code);
-    if (status == NATS_TIMEOUT)
+    if (status == NATS_TIMEOUT && connection_->isUp())
         return {};
     if (status != NATS_OK) {
         connection_->subscription.reset();
@@ -358,8 +372,8 @@ std::expected<void, std::string> JetStream::putSome(std::span<const Put> puts, s
     return {};
 }
 
-std::expected<void, std::string> JetStream::publish(const std::string& subject, std::string_view payload,
-                                                    const Headers& headers)
+std::expected<Publication, std::string> JetStream::publish(const std::string& subject, std::string_view payload,
+                                                           const Headers& headers)
 {
     natsMsg* made = nullptr;
     natsStatus status =
@@ -368,11 +382,14 @@ std::expected<void, std::string> JetStream::publish(const std::string& subject, 
     for (const auto& [name, value] : headers)
         if (status == NATS_OK)
             status = natsMsgHeader_Set(made, name.c_str(), value.c_str());
+    jsErrCode code{};
     if (status == NATS_OK)
-        status = js_PublishMsg(nullptr, connection_->context.get(), made, nullptr, nullptr);
+        status = js_PublishMsg(nullptr, connection_->context.get(), made, nullptr, &code);
+    if (status == NATS_MAX_PAYLOAD || code == JSStreamMessageExceedsMaximumErr)
+        return Publication::TooLarge;
     if (status != NATS_OK)
         return std::unexpected(connection_->reason(fmt::format("{} cannot be published", subject), status));
-    return {};
+    return Publication::Taken;
 }
 
 } // namespace kesto_ingest

@@ -47,8 +47,8 @@ public:
     void giveBack(const Delivery& delivery) override;
     [[nodiscard]] std::expected<std::optional<Entry>, std::string> last(const std::string& subject) override;
     [[nodiscard]] std::expected<std::vector<PutAnswer>, std::string> put(std::span<const Put> puts) override;
-    [[nodiscard]] std::expected<void, std::string> publish(const std::string& subject, std::string_view payload,
-                                                           const Headers& headers) override;
+    [[nodiscard]] std::expected<Publication, std::string> publish(const std::string& subject, std::string_view payload,
+                                                                  const Headers& headers) override;
 
 private:
     struct Connection;

@@ -40,6 +40,11 @@ struct Put {
 };
 using PutAnswer = std::optional<std::uint64_t>; // the sequence of the new one; none: the last is another
 
+enum class Publication : std::uint8_t {
+    Taken,
+    TooLarge // for the stream or a server; it would be again
+};
+
 using Headers = std::map<std::string, std::string>;
 
 // One thread. Errors are for a person.
@@ -62,8 +67,8 @@ public:
     [[nodiscard]] virtual std::expected<std::optional<Entry>, std::string> last(const std::string& subject) = 0;
     // Publishes each, without waiting for the one before. The error says that some may not be there.
     [[nodiscard]] virtual std::expected<std::vector<PutAnswer>, std::string> put(std::span<const Put> puts) = 0;
-    [[nodiscard]] virtual std::expected<void, std::string> publish(const std::string& subject, std::string_view payload,
-                                                                   const Headers& headers) = 0;
+    [[nodiscard]] virtual std::expected<Publication, std::string>
+    publish(const std::string& subject, std::string_view payload, const Headers& headers) = 0;
 };
 
 } // namespace kesto_ingest

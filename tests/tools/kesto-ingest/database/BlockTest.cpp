@@ -38,10 +38,19 @@ TEST(Block, GivesItsRowsBack)
 TEST(Block, HasFewWeeks)
 {
     Block block;
-    for (std::uint32_t week = 0; week < 50; ++week)
+    for (std::uint32_t week = 0; week < 49; ++week)
         block.add("a\n", week, 0);
-    EXPECT_TRUE(block.takes(49));
-    EXPECT_FALSE(block.takes(50));
+    EXPECT_TRUE(block.takes(48));
+    EXPECT_FALSE(block.takes(49));
+}
+
+TEST(Block, HasABoundOfBytes)
+{
+    Block block;
+    block.add(std::string((16U << 20) - 1, 'x'), 1, 0);
+    EXPECT_TRUE(block.takes(1));
+    block.add("x", 1, 0);
+    EXPECT_FALSE(block.takes(1));
 }
 
 TEST(InsertBlock, InsertsAllAtOnce)
@@ -81,6 +90,16 @@ TEST(InsertBlock, SuspectsTheTablesIfEveryRowIsRefused)
     for (int row = 0; row < 32; ++row)
         block.add("bad\n", 0, 0);
     EXPECT_THAT(insertBlock(database, "events", block).value(), SizeIs(32));
+}
+
+TEST(InsertBlock, SuspectsTablesOfAnotherEditionAtOnce)
+{
+    FakeDatabase database;
+    database.refusedWord = "bad";
+    database.editionOfTables = 2;
+    EXPECT_EQ(insertBlock(database, "events", blockOf({"bad"})).error(),
+              "the tables are of another edition, or not there: no such word");
+    EXPECT_THAT(insertBlock(database, "events", blockOf({"good", "bad"})).value(), SizeIs(1));
 }
 
 TEST(ExceptionCode, IsTheNumberInTheAnswer)

@@ -136,6 +136,14 @@ TEST(ClickHouseTables, HoldWhatRowsTell)
     EXPECT_EQ(provider.database().edition(), 0U);
     EXPECT_EQ(server.select("CREATE VIEW edition AS SELECT toUInt64(7) AS edition"), "");
     EXPECT_EQ(provider.database().edition(), 7U);
+
+    // The profile need not have the setting that makes an answer mean that the rows are on their shard.
+    EXPECT_EQ(server.select("DROP TABLE edition"), "");
+    EXPECT_EQ(server.select("CREATE VIEW edition AS SELECT toUInt64(value) AS edition FROM system.settings "
+                            "WHERE name = 'insert_distributed_sync'"),
+              "");
+    EXPECT_EQ(server.select("SELECT max(edition) FROM edition"), "0");
+    EXPECT_EQ(provider.database().edition(), 1U);
 }
 
 TEST(Tables, AreMadeForOneServerOrACluster)

@@ -28,10 +28,11 @@ public:
     {
         if (isAway)
             return std::unexpected("away");
-        return 1;
+        return editionOfTables;
     }
 
     bool isAway = false;
+    std::uint64_t editionOfTables = 1;
     std::string refusedWord = "a word that no row has";
     std::map<std::string, std::vector<std::string>> tables;
     std::vector<std::string> blocks;

@@ -62,7 +62,7 @@ public:
     }
     [[nodiscard]] std::expected<std::vector<PutAnswer>, std::string> put(std::span<const Put> asked) override
     {
-        if (isAway)
+        if (isAway || takesNoPut)
             return std::unexpected("away");
         std::vector<PutAnswer> answers;
         for (const Put& each : asked) {
@@ -76,16 +76,18 @@ public:
         }
         return answers;
     }
-    [[nodiscard]] std::expected<void, std::string> publish(const std::string& subject, std::string_view payload,
-                                                           const Headers& headers) override
+    [[nodiscard]] std::expected<Publication, std::string> publish(const std::string& subject, std::string_view payload,
+                                                                  const Headers& headers) override
     {
         if (isAway || isDeaf)
             return std::unexpected("away");
+        if (payload.size() > largestLetter)
+            return Publication::TooLarge;
         const std::string& identity = headers.at("Nats-Msg-Id");
         if (std::ranges::none_of(letters,
                                  [&](const Letter& each) { return each.headers.at("Nats-Msg-Id") == identity; }))
             letters.push_back({subject, std::string(payload), headers});
-        return {};
+        return Publication::Taken;
     }
 
     // As the stream does if a copy of the program was killed.
@@ -94,10 +96,14 @@ public:
         waiting_.insert(waiting_.end(), taken_.begin(), taken_.end());
         taken_.clear();
     }
+    // Gives back in any order, as several copies do.
+    void rotate() { std::ranges::rotate(waiting_, waiting_.begin() + 1); }
     [[nodiscard]] std::size_t unacknowledged() const { return waiting_.size() + taken_.size(); }
 
     bool isAway = false;
     bool isDeaf = false; // for what is published
+    bool takesNoPut = false;
+    std::size_t largestLetter = 1'000'000;
     int toldThatWorkGoesOn = 0;
     int puts = 0; // those that were taken
     std::map<std::string, Entry> entries;

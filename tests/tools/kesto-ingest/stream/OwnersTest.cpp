@@ -101,6 +101,27 @@ TEST(Confirmations, TellSeveralDevicesAtOnce)
     EXPECT_EQ(stream.puts, 2);
 }
 
+TEST(Confirmations, KeepTheLargestOfAnEpoch)
+{
+    FakeStream stream;
+    const std::vector<Confirmation> several = {{"one", "d", "e1", 9}, {"one", "d", "e1", 4}};
+    EXPECT_TRUE(Confirmations(stream).tell(several));
+    EXPECT_EQ(stream.entries["kesto.stored.one.d"].payload, R"({"epoch":"e1","id":9})");
+}
+
+TEST(Confirmations, ARepeatedBatchDoesNotBringAnOldEpochBack)
+{
+    FakeStream stream;
+    Confirmations confirmations(stream);
+    EXPECT_TRUE(tell(confirmations, "e2", 3));
+    const Confirmation old{.credential = "one", .device = "d", .epoch = "e1", .id = 70, .isRepeated = true};
+    EXPECT_TRUE(confirmations.tell({&old, 1}));
+    EXPECT_EQ(stream.entries["kesto.stored.one.d"].payload, R"({"epoch":"e2","id":3})");
+    const std::vector<Confirmation> together = {{"one", "d", "e2", 5}, old};
+    EXPECT_TRUE(confirmations.tell(together));
+    EXPECT_EQ(stream.entries["kesto.stored.one.d"].payload, R"({"epoch":"e2","id":5})");
+}
+
 TEST(Confirmations, DoNotPassAFasterCopy)
 {
     RacingStream stream;
@@ -119,7 +140,7 @@ TEST(DeadLetters, TellTheReasonOfEachRow)
 {
     FakeStream stream;
     const std::vector<DeadRow> rows = {{"too \"long\"", "{\n}"}, {"caf\xc3", "\xff"}};
-    EXPECT_TRUE(putRowsAside(stream, deliveryOf("kesto.events.one"), rows));
+    EXPECT_EQ(putRowsAside(stream, deliveryOf("kesto.events.one"), rows, [] { }), 0U);
     ASSERT_THAT(stream.letters, SizeIs(1));
     EXPECT_EQ(stream.letters[0].subject, "kesto.dead.one");
     EXPECT_EQ(stream.letters[0].payload,
@@ -133,18 +154,47 @@ TEST(DeadLetters, AreSplitAndCut)
     FakeStream stream;
     const std::string line(100'000, 'x');
     const std::vector<DeadRow> rows(9, DeadRow{"long", line});
-    EXPECT_TRUE(putRowsAside(stream, deliveryOf("kesto.events.one"), rows));
+    int calls = 0;
+    EXPECT_EQ(putRowsAside(stream, deliveryOf("kesto.events.one"), rows, [&calls] { ++calls; }), 0U);
+    EXPECT_EQ(calls, 2);
     ASSERT_THAT(stream.letters, SizeIs(2));
-    // A row of 64 KiB and 27 bytes around it; eight of them reach 512 KiB.
-    EXPECT_EQ(stream.letters[0].payload.size(), 8U * (64 * 1024 + 27));
-    EXPECT_EQ(stream.letters[1].payload.size(), 64U * 1024 + 27);
+    // A row of 64 KiB and 27 bytes around it; eight of them would pass 512 KiB.
+    EXPECT_EQ(stream.letters[0].payload.size(), 7U * (64 * 1024 + 27));
+    EXPECT_EQ(stream.letters[1].payload.size(), 2U * (64 * 1024 + 27));
     EXPECT_EQ(stream.letters[1].headers["Nats-Msg-Id"], "KESTO:42:1");
+}
+
+TEST(DeadLetters, AreCutToWhatTheStreamTakes)
+{
+    FakeStream stream;
+    Delivery delivery = deliveryOf("kesto.events.one");
+    const std::string payload(900'000, 'x');
+    delivery.payload = payload;
+    EXPECT_EQ(putBatchAside(stream, delivery, std::string(5000, 'r')), 0U);
+    ASSERT_THAT(stream.letters, SizeIs(1));
+    EXPECT_EQ(stream.letters[0].payload.size(), 524288U);
+    EXPECT_EQ(stream.letters[0].headers["Kesto-Reason"].size(), 1000U);
+    const std::string controls(100'000, '\1');
+    const std::vector<DeadRow> rows(4, DeadRow{"six times as long", controls});
+    EXPECT_EQ(putRowsAside(stream, delivery, rows, [] { }), 0U);
+    for (const auto& letter : stream.letters)
+        EXPECT_LE(letter.payload.size(), 524288U);
+}
+
+TEST(DeadLetters, CountThoseThatAreTooLarge)
+{
+    FakeStream stream;
+    stream.largestLetter = 4;
+    EXPECT_EQ(putBatchAside(stream, deliveryOf("kesto.events.one"), "r"), 1U);
+    const std::vector<DeadRow> rows = {{"r", "x"}};
+    EXPECT_EQ(putRowsAside(stream, deliveryOf("kesto.events.one"), rows, [] { }), 1U);
+    EXPECT_THAT(stream.letters, SizeIs(0));
 }
 
 TEST(DeadLetters, KeepAWholeBatchAsItCame)
 {
     FakeStream stream;
-    EXPECT_TRUE(putBatchAside(stream, deliveryOf("kesto.events.a.b"), "bad\r\nInjected: yes"));
+    EXPECT_EQ(putBatchAside(stream, deliveryOf("kesto.events.a.b"), "bad\r\nInjected: yes"), 0U);
     ASSERT_THAT(stream.letters, SizeIs(1));
     EXPECT_EQ(stream.letters[0].subject, "kesto.dead.unknown");
     EXPECT_EQ(stream.letters[0].payload, "bytes");

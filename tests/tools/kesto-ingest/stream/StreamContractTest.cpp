@@ -23,12 +23,16 @@ public:
     StreamProvider& operator=(const StreamProvider&) = delete;
     virtual Stream& stream() = 0;
     virtual void send(const std::string& payload) = 0;
+    virtual std::string lastLetter() = 0;
+    virtual void end() = 0;
 };
 
 class FakeProvider : public StreamProvider {
 public:
     Stream& stream() override { return stream_; }
     void send(const std::string& payload) override { stream_.send("kesto.events.device-1", payload); }
+    std::string lastLetter() override { return stream_.letters.back().payload; }
+    void end() override { stream_.isAway = true; }
 
 private:
     FakeStream stream_;
@@ -42,12 +46,22 @@ public:
         const auto sent = device_.publish("kesto.events.device-1", payload, {{"Kesto-Edition", "1"}});
         ASSERT_TRUE(sent) << sent.error();
     }
+    std::string lastLetter() override
+    {
+        const auto entry = JetStream(as("admin")).last("kesto.dead.device-1");
+        return entry && *entry ? (*entry)->payload : "";
+    }
+    void end() override { server_.end(); }
 
-private:
     [[nodiscard]] JetStreamConfiguration as(const std::string& name) const
     {
-        return {.servers = {server_.address()}, .user = name, .password = name};
+        return {.servers = {server_.address()},
+                .user = name,
+                .password = name,
+                .timeLimit = std::chrono::milliseconds{10'000}};
     }
+
+private:
     [[nodiscard]] bool setUp() const
     {
         JetStream admin(as("admin"));
@@ -151,7 +165,45 @@ TEST_P(StreamContract, PutsManyMessages)
 
 TEST_P(StreamContract, PublishesWithHeaders)
 {
-    EXPECT_TRUE(stream.publish("kesto.dead.device-1", "letter", {{"Nats-Msg-Id", "KESTO:1:0"}, {"Kesto-Reason", "r"}}));
+    const Headers headers = {{"Nats-Msg-Id", "KESTO:1:0"}, {"Kesto-Reason", "r"}};
+    EXPECT_EQ(stream.publish("kesto.dead.device-1", "letter", headers), Publication::Taken);
+    EXPECT_EQ(stream.publish("kesto.dead.device-1", "again", headers), Publication::Taken);
+    EXPECT_EQ(provider->lastLetter(), "letter") << "one with the same ID is there";
+    for (const std::size_t size : {1'000'001U, 2'000'000U}) { // too large for the stream, and for the server
+        const auto published =
+            stream.publish("kesto.dead.device-1", std::string(size, 'x'), {{"Nats-Msg-Id", "KESTO:2:0"}});
+        ASSERT_TRUE(published) << published.error();
+        EXPECT_EQ(*published, Publication::TooLarge);
+    }
+}
+
+TEST_P(StreamContract, SaysThatItIsAway)
+{
+    EXPECT_THAT(stream.fetch(1, milliseconds{50}).value(), SizeIs(0));
+    provider->end();
+    bool isAway = false;
+    for (int attempt = 0; attempt < 50 && !isAway; ++attempt) // the connection's end takes a moment
+        isAway = !stream.fetch(1, milliseconds{200});
+    EXPECT_TRUE(isAway);
+}
+
+TEST(JetStreamSetUp, MayBeRepeatedWithOtherSizesOnAFullServer)
+{
+    JetStreamProvider provider;
+    JetStream admin(provider.as("admin"));
+    const StreamSizes large{.eventsBytes = std::int64_t{12} << 30, .deadBytes = std::int64_t{3} << 30};
+    for (int attempt = 0; attempt < 2; ++attempt) {
+        const auto done = admin.setUp(large);
+        EXPECT_TRUE(done) << done.error();
+    }
+}
+
+TEST(JetStreamConnection, IsNeverPlainIfTLSIsAskedFor)
+{
+    JetStreamProvider provider;
+    JetStreamConfiguration configuration = provider.as("admin");
+    configuration.servers[0].replace(0, std::string_view("nats").size(), "tls");
+    EXPECT_THROW(JetStream stream(configuration), std::runtime_error);
 }
 
 INSTANTIATE_TEST_SUITE_P(Of, StreamContract, testing::Values("Fake", "JetStream"),
