@@ -146,9 +146,11 @@ RC_GTEST_PROP(OutboxProperties, NoKeyLeavesThatNoRuleNames, ())
     Outbox outbox = made.outbox();
     for (const Batch& batch : allBatches(outbox))
         for (const Dictionary& row : rowsIn(batch.lines))
-            if (textIn(row, "kind") == "event")
-                for (const auto& [key, value] : *row.find("payload")->dictionary())
+            if (textIn(row, "kind") == "event") {
+                const auto payload = row.find("payload")->dictionary();
+                for (const auto& [key, value] : *payload)
                     RC_ASSERT(mayLeave(made.configuration, textIn(row, "name"), std::string(key.view())));
+            }
 }
 
 RC_GTEST_PROP(OutboxProperties, EachRowLeavesOnceHoweverBatchesAreCut, ())
