@@ -205,7 +205,10 @@ int main(int argumentCount, char** arguments)
         app.parse(argumentCount, arguments);
         if (tablesCommand->parsed()) {
             fmt::print("{}", tablesSql(databaseName, cluster));
-            return EX_OK;
+            if (std::fflush(stdout) == 0)
+                return EX_OK;
+            log("the output could not be written");
+            return EX_IOERR;
         }
         const auto configuration = readConfiguration(file);
         if (!configuration) {

@@ -1,16 +1,12 @@
 // SPDX-License-Identifier: Apache-2.0
 // kesto: lets a person call the service and read its results.
 #include "kesto/Commands.h"
+#include "kesto/RunCommandLine.h"
 
 #include <CLI/Error.hpp>
 #include <charconv>
 #include <cstdint>
-#include <cstdio>
-#include <exception>
-#include <fcntl.h>
-#include <stdexcept>
 #include <string>
-#include <unistd.h>
 
 void requireSubcommand(CLI::App& application)
 {
@@ -48,19 +44,6 @@ CLI::Validator secondsToWait()
         "");
 }
 
-namespace {
-
-// Where the caller has closed one of the three, the next file or socket would get its number, and what is printed would
-// go there. Standard output gets a file that cannot be written, so that a lost output is a failure.
-void fillStandardDescriptors()
-{
-    for (const int number : {STDIN_FILENO, STDOUT_FILENO, STDERR_FILENO})
-        if (::fcntl(number, F_GETFD) < 0)
-            ::open("/dev/null", number == STDERR_FILENO ? O_WRONLY : O_RDONLY); // stays open under that number
-}
-
-} // namespace
-
 int main(int argumentCount, char** arguments)
 {
     fillStandardDescriptors();
@@ -81,15 +64,5 @@ int main(int argumentCount, char** arguments)
     addTopCommand(application, exitStatus);
     addTraceCommand(application, exitStatus);
     addUplinkCommand(application);
-    try {
-        application.parse(argumentCount, arguments);
-        if (std::fflush(stdout) != 0 || std::ferror(stdout) != 0)
-            throw std::runtime_error("the output could not be written");
-        return exitStatus;
-    } catch (const CLI::ParseError& error) {
-        return application.exit(error) == 0 ? exitOk : exitUsage; // CLI11 reports help and version as errors, too
-    } catch (const std::exception& exception) {
-        std::fprintf(stderr, "kesto: %s\n", exception.what());
-        return exitFailure;
-    }
+    return runCommandLine(application, argumentCount, arguments, exitStatus);
 }

@@ -62,6 +62,17 @@ protected:
     const std::filesystem::path state = directory / "state";
 };
 
+TEST_F(UplinkCommands, FailWhenTheirOutputIsLost)
+{
+    configure(rules);
+    const MadeEventStore store(database);
+    const Finished status = sdk_test::run({"/bin/sh", "-c", R"(exec "$0" "$@" <&- >&-)", KESTO_UPLINK_PATH, "status",
+                                           "--configuration", configuration, "--database", database, "--state", state},
+                                          {}, {"TZ=UTC", "LC_ALL=C.UTF-8"});
+    EXPECT_EQ(status.status, 1);
+    EXPECT_EQ(status.errors, "kesto-uplink: the output could not be written\n");
+}
+
 TEST_F(UplinkCommands, PreviewPrintsTheLinesThatWouldLeave)
 {
     configure(rules);
