@@ -196,7 +196,7 @@ struct SessionList {
     client::SessionMap::Place lastPlace = 0;
 };
 
-// Also a walk that paused anywhere goes on there, whatever came and went meanwhile.
+// A walk may pause behind any place. It goes on with the next entry that is in the map by then.
 TEST(SessionMap, IsAListSearchedFromItsBeginning)
 {
     support::TestPlatform platform;

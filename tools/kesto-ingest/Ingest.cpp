@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The order in which a batch is worked off: its owner is checked, its rows are stored, what is wrong is put aside, its
-// device is told, and then the stream may forget it.
+// The steps of a batch. The ingest checks its owner, stores its rows, puts aside what is wrong and tells its device.
+// Only then it acknowledges the batch to the stream.
 #include "kesto-ingest/Ingest.h"
 
 #include "kesto-ingest/stream/DeadLetters.h"

@@ -40,7 +40,7 @@ bool hasEnded(const sdk_test::Process& process)
     return ended.si_pid != 0;
 }
 
-// A port of 127.0.0.1 that nobody uses now.
+// The kernel chooses a port of 127.0.0.1. Another program may take it before the server does.
 std::uint16_t freePort()
 {
     const platform::FileDescriptor made(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));

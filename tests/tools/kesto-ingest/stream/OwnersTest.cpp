@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The credential that uses a pseudonym first keeps it; what a device is told never goes back; dead letters tell why.
+// The stream gives a pseudonym to the credential that used it first. Confirmations of an epoch only grow. Each dead
+// letter has a reason.
 #include "kesto-ingest/stream/Owners.h"
 
 #include "kesto-ingest/stream/Confirmations.h"

@@ -272,7 +272,7 @@ TEST_F(RoundTest, whatMayNotLeaveIsPassedWithoutAConnection)
     EXPECT_EQ(run().outcome, Outcome::Nothing);
     EXPECT_EQ(stream.connections, 0);
     EXPECT_EQ(state.queued(), (Cursor{"aa", 20}));
-    EXPECT_EQ(state.stored(), (Cursor{"aa", 20})); // nobody will confirm it
+    EXPECT_EQ(state.stored(), (Cursor{"aa", 20})); // the fleet confirms only what was sent
     store.newest = 25;
     EXPECT_EQ(run().outcome, Outcome::Sent);
     EXPECT_THAT(ranges(), ElementsAre("aa:21:25"));

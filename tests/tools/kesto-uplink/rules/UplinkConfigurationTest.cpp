@@ -168,7 +168,7 @@ TEST(UplinkConfiguration, SaysWhatARuleIs)
                             "or a bucket such as { bucket = [1, 10, 60] }"));
 }
 
-// An edge takes the place of the number, and receivers refuse what is no number of this column.
+// The uplink sends the edge in place of the number. Receivers take whole numbers in these columns only.
 TEST(UplinkConfiguration, SaysWhichEdgesAColumnCanHave)
 {
     EXPECT_THAT(problems("[stretches]\nchannels = { bucket = [1, 2.5] }\n"),

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// The whole path of the device, through real programs: what clients report to kestod is in the stream, once, whatever
-// is killed in between.
+// A real kestod, a real uplink and a real nats-server. Each event that a client reports arrives in the stream once,
+// although tests kill the uplink or the server in between.
 #include "end_to_end/Kestod.h"
 #include "end_to_end/WireClient.h"
 #include "kesto-uplink/state/State.h"
