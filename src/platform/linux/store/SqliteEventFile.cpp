@@ -6,6 +6,7 @@
 #include <fcntl.h>
 #include <fmt/format.h>
 #include <sys/file.h>
+#include <tuple>
 #include <utility>
 #include <vector>
 
@@ -147,6 +148,9 @@ SqliteEventFile::Expected<> SqliteEventFile::beginRun()
     StoreCounts& counts = counts_.counts();
     // A database without a past has the time of this moment there.
     const auto endOfEarlierRun = counts.nextEvent > 1 ? std::optional(counts.clock.wall) : std::nullopt;
+    // The log of this transaction reaches the disk before an event can be read.
+    if (const auto done = setSynchronization(StoreSynchronization::Full); !done)
+        return done;
     ageClock_.emplace(clock_, counts.clock, counts.nextEvent);
     committedAgeClock_ = ageClock_;
     const bool isKnown = origins_.epoch == counts_.epoch();
@@ -156,6 +160,9 @@ SqliteEventFile::Expected<> SqliteEventFile::beginRun()
         stretches_.forgetRows();
     }
     const auto done = inTransaction([&]() -> Expected<> {
+        if (const auto begun = OpenRun::begin(*connection_, origins_.bootIdentifier, clock_.secondsSince1970(), counts);
+            !begun)
+            return begun;
         if (const auto marked = ages_.markNow(counts.nextEvent, counts.clock.time); !marked)
             return marked;
         return isKnown ? Expected<>() : closeEarlierRun(endOfEarlierRun);
@@ -183,6 +190,12 @@ SqliteEventFile::Expected<> SqliteEventFile::closeEarlierRun(std::optional<doubl
     if (const auto done = stretchRows_.forgetUnfinished(); !done)
         return done;
     return originRows_.closeEarlierRun(counts_.counts());
+}
+
+void SqliteEventFile::endRun()
+{
+    std::ignore = OpenRun::end(*connection_);
+    connection_->truncateLog(); // if a reader needs it, the next start checks the database for nothing
 }
 
 SqliteEventFile::Expected<> SqliteEventFile::setSynchronization(StoreSynchronization synchronization)

@@ -15,6 +15,7 @@
 #include "platform/linux/store/tables/EventHolders.h"
 #include "platform/linux/store/tables/EventKinds.h"
 #include "platform/linux/store/tables/FirstEdition.h"
+#include "platform/linux/store/tables/OpenRun.h"
 #include "platform/linux/store/tables/OriginRows.h"
 #include "platform/linux/store/tables/StoreSchema.h"
 #include "platform/linux/store/tables/StretchRows.h"
@@ -47,6 +48,8 @@ public:
     // For what is not events: the database must be opened again when its tables were changed.
     [[nodiscard]] SqliteConnection& connection() noexcept { return *connection_; }
 
+    // In order, so that the next run goes on where this one ends. No event may follow.
+    void endRun();
     [[nodiscard]] Expected<> setSynchronization(StoreSynchronization synchronization);
 
     // Inserts between `begin` and `commit` are kept together or not at all; `rollBack` drops them.

@@ -158,7 +158,7 @@ void SqliteKeeper::prepareForEnd()
 {
     check_.breakOff();
     if (database_)
-        database_->connection().truncateLog(); // if a reader needs it, the next start checks the database for nothing
+        database_->endRun();
 }
 
 // --- Keeping

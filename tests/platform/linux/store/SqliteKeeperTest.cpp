@@ -98,6 +98,16 @@ protected:
             batch.add(time, name, payload);
         keeper.keep(batch, tally);
     }
+    // As a machine that lost power while the service ran.
+    void noteRunOfTheMachine(const std::string& bootIdentifier) const
+    {
+        sqlite3* connection = nullptr;
+        ASSERT_EQ(::sqlite3_open(file().c_str(), &connection), SQLITE_OK);
+        const std::string sql = fmt::format("UPDATE open_run SET boot = '{}'", bootIdentifier);
+        EXPECT_EQ(::sqlite3_exec(connection, sql.c_str(), nullptr, nullptr, nullptr), SQLITE_OK);
+        EXPECT_EQ(::sqlite3_changes(connection), 1);
+        ::sqlite3_close(connection);
+    }
     void keep(const std::vector<PlainEvent>& given) { keepIn(keeper(), given, tally); }
     void maintain(bool isQuiet = true)
     {
@@ -296,6 +306,45 @@ TEST_F(SqliteKeeperTest, NumbersAreNeverUsedTwice)
     closeWriter();
     keep({event(3)});
     EXPECT_EQ(StoreReader(file()).text("SELECT id FROM events"), "3");
+}
+
+TEST_F(SqliteKeeperTest, SkipsTheNumbersThatALossOfPowerMayHaveTaken)
+{
+    keep({event(1), event(2)});
+    closeWriter(); // as a kill does
+    keep({event(3)});
+    closeWriter();
+    EXPECT_EQ(StoreReader(file()).text("SELECT max(id) FROM events"), "3") << "the machine ran on";
+    noteRunOfTheMachine("00000000-0000-4000-8000-000000000001");
+    keep({event(4)});
+    closeWriter();
+    EXPECT_EQ(StoreReader(file()).text("SELECT max(id) FROM events"), "1000000004");
+    EXPECT_EQ(StoreReader(file()).text("SELECT next_source || ' ' || next_session FROM store"), "1000001 1000001");
+    keep({event(5)});
+    EXPECT_EQ(StoreReader(file()).text("SELECT max(id) FROM events"), "1000000005");
+    EXPECT_EQ(StoreReader(file()).text("SELECT kept - removed FROM store"), "5");
+}
+
+TEST_F(SqliteKeeperTest, SkipsNoNumbersAfterAnEndInOrder)
+{
+    keep({event(1)});
+    keeper().prepareForEnd();
+    closeWriter();
+    EXPECT_EQ(StoreReader(file()).text("SELECT count(*) FROM open_run"), "0");
+    keep({event(2)});
+    EXPECT_EQ(StoreReader(file()).text("SELECT max(id) FROM events"), "2");
+    EXPECT_EQ(StoreReader(file()).text("SELECT boot FROM open_run") + '\n',
+              support::readFile("/proc/sys/kernel/random/boot_id"));
+}
+
+TEST_F(SqliteKeeperTest, TheNoteOfARunReachesTheDiskBeforeAnEvent)
+{
+    keeper().open();
+    closeWriter();
+    noteRunOfTheMachine("00000000-0000-4000-8000-000000000001");
+    const int before = synchronizations;
+    keeper().open();
+    EXPECT_GT(synchronizations, before);
 }
 
 TEST_F(SqliteKeeperTest, GoesOnWithTheDatabaseThatIsThere)

@@ -71,6 +71,9 @@ constexpr std::string_view laterTables =
     ") STRICT;"
     "CREATE TABLE IF NOT EXISTS earlier_epochs("
     "below INTEGER PRIMARY KEY, epoch TEXT NOT NULL"
+    ") STRICT;"
+    "CREATE TABLE IF NOT EXISTS open_run("
+    "row INTEGER PRIMARY KEY CHECK (row = 1), boot TEXT NOT NULL, began REAL NOT NULL"
     ") STRICT;";
 
 constexpr std::string_view view =

@@ -1,0 +1,27 @@
+// SPDX-License-Identifier: Apache-2.0
+// In which run of the machine the database was opened and not closed. A machine that loses power loses the last
+// transactions, but readers may have read them: so the next run skips the IDs that they may have used.
+#pragma once
+
+#include "platform/linux/store/SqliteConnection.h"
+#include "platform/linux/store/tables/StoreSchema.h"
+
+#include <string_view>
+
+namespace platform {
+
+class OpenRun {
+public:
+    // Far more than one log can hold.
+    static constexpr std::int64_t skippedEvents = 1'000'000'000;
+    static constexpr std::int64_t skippedOrigins = 1'000'000; // sources, and sessions
+
+    // Inside a transaction that must reach the disk: notes this run, and skips IDs if another run of the machine did
+    // not close the database.
+    [[nodiscard]] static StoreExpected<> begin(SqliteConnection& connection, std::string_view bootIdentifier,
+                                               double now, StoreCounts& counts);
+    // The database is closed in order. If this does not reach the disk, the next run skips IDs for nothing.
+    [[nodiscard]] static StoreExpected<> end(SqliteConnection& connection);
+};
+
+} // namespace platform
