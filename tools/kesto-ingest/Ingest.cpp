@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // The steps of a batch. The ingest checks its owner, stores its rows, puts aside what is wrong and tells its device.
-// Only then it acknowledges the batch to the stream.
+// Only then it acknowledges the batch to the stream. Loads are stored one after another, so devices are told in order.
 #include "kesto-ingest/Ingest.h"
 
 #include "kesto-ingest/stream/DeadLetters.h"
@@ -16,20 +16,16 @@ namespace kesto_ingest {
 
 namespace {
 
+using std::chrono::milliseconds;
+
 constexpr std::string_view knownEdition = "1";
 constexpr std::size_t mostFetched = 8; // batches, of which each may become large
-constexpr std::chrono::milliseconds longestWait{1000};
-constexpr std::chrono::milliseconds shortestWait{1};
+constexpr milliseconds longestWait{1000};
+constexpr milliseconds shortestWait{1};
+constexpr milliseconds waitWhileStoring{50}; // for batches: what is stored shall be answered soon
 constexpr std::chrono::minutes rememberGivenBack{1}; // then another copy has it
 constexpr std::size_t mostGivenBack = 10'000;
 constexpr std::chrono::seconds holdOnEvery{10}; // of the 60 that the stream waits
-
-Counter storedRows(Table table)
-{
-    constexpr std::array<Counter, tableCount> counters = {Counter::RowsStoredBatches, Counter::RowsStoredEvents,
-                                                          Counter::RowsStoredStretches, Counter::RowsStoredSessions};
-    return counters[static_cast<std::size_t>(table)];
-}
 
 } // namespace
 
@@ -48,14 +44,16 @@ void Ingest::turn()
 {
     holdOn();
     const auto now = surroundings_.now();
-    if (nextAttempt_ && now < *nextAttempt_) // nothing more is taken meanwhile: other copies may have more luck
-        surroundings_.rest(std::min(longestWait, std::chrono::ceil<std::chrono::milliseconds>(*nextAttempt_ - now)));
-    else if (held_.empty() || (!nextAttempt_ && !isDue()))
+    if (!isStoring() && nextAttempt_ && now < *nextAttempt_)
+        return surroundings_.rest(std::min(longestWait, std::chrono::ceil<milliseconds>(*nextAttempt_ - now)));
+    if (!isStoring() && (!storing_.batches.empty() || (isDue() && !nextAttempt_)))
+        startStoring();
+    // Nothing more is taken after a failure: other copies may have more luck.
+    const bool takesMore = !isStoring() || !(isFull() || nextAttempt_);
+    if (isStoring() && isStored(takesMore ? milliseconds{0} : longestWait))
+        endStoring();
+    else if (takesMore)
         takeWhatComes();
-    else if (auto stored = store(); stored)
-        succeed();
-    else
-        fail(stored.error());
 }
 
 void Ingest::takeWhatComes()
@@ -73,11 +71,13 @@ void Ingest::takeWhatComes()
 void Ingest::fetch()
 {
     auto wait = longestWait;
-    if (!held_.empty())
-        wait = std::clamp(std::chrono::ceil<std::chrono::milliseconds>(oldest_ + limits_.joining - surroundings_.now()),
-                          shortestWait, longestWait);
+    if (isStoring())
+        wait = waitWhileStoring;
+    else if (!taking_.batches.empty())
+        wait = std::clamp(std::chrono::ceil<milliseconds>(taking_.oldest + limits_.joining - surroundings_.now()),
+                          shortestWait, wait);
     // The first comes at once; the stream gives several together, and may wait for the last of them.
-    auto deliveries = stream_.fetch(held_.empty() ? 1 : mostFetched, wait);
+    auto deliveries = stream_.fetch(taking_.batches.empty() ? 1 : mostFetched, wait);
     metrics_.isStreamUp = deliveries.has_value();
     if (!deliveries) {
         metrics_.add(Counter::StreamFailures);
@@ -85,8 +85,10 @@ void Ingest::fetch()
     }
     if (nextAttempt_)
         succeed();
-    if (held_.empty())
-        oldest_ = heldOn_ = surroundings_.now();
+    if (taking_.batches.empty())
+        taking_.oldest = surroundings_.now();
+    if (taking_.batches.empty() && storing_.batches.empty())
+        heldOn_ = surroundings_.now();
     std::ranges::move(*deliveries, std::back_inserter(fetched_));
 }
 
@@ -95,34 +97,47 @@ void Ingest::finish()
     for (const Delivery& delivery : fetched_)
         stream_.giveBack(delivery);
     fetched_.clear();
-    const auto stored = store();
-    if (stored)
-        return;
-    surroundings_.log(fmt::format("what was not stored goes back to the stream: {}", stored.error()));
-    for (const Held& held : held_)
+    while (!storing_.batches.empty() || !taking_.batches.empty()) {
+        if (!isStoring())
+            startStoring();
+        while (!isStored(longestWait))
+            holdOn();
+        if (const Outcome stored = answerWhatIsStored(); !stored) {
+            surroundings_.log(fmt::format("what was not stored goes back to the stream: {}", stored.error()));
+            giveBackAll(storing_);
+            return giveBackAll(taking_);
+        }
+    }
+}
+
+void Ingest::giveBackAll(const Load& load)
+{
+    for (const Held& held : load.batches)
         stream_.giveBack(held.delivery);
 }
 
 void Ingest::holdOn()
 {
     const auto now = surroundings_.now();
-    if ((held_.empty() && fetched_.empty()) || now - heldOn_ < holdOnEvery)
+    const bool hasNothing = taking_.batches.empty() && storing_.batches.empty() && fetched_.empty();
+    if (hasNothing || now - heldOn_ < holdOnEvery)
         return;
     heldOn_ = now;
     for (const Delivery& delivery : fetched_)
         stream_.workGoesOn(delivery);
-    for (const Held& held : held_)
-        stream_.workGoesOn(held.delivery);
+    for (const Load* const load : {&taking_, &storing_})
+        for (const Held& held : load->batches)
+            stream_.workGoesOn(held.delivery);
 }
 
 bool Ingest::isDue() const
 {
-    return !held_.empty() && (isFull() || surroundings_.now() - oldest_ >= limits_.joining);
+    return !taking_.batches.empty() && (isFull() || surroundings_.now() - taking_.oldest >= limits_.joining);
 }
 
 bool Ingest::isFull() const
 {
-    return rows_ >= limits_.rows || bytes_ >= limits_.bytes;
+    return taking_.rows >= limits_.rows || taking_.bytes >= limits_.bytes;
 }
 
 // A device that is told of a batch forgets what is in the earlier ones, too.
@@ -149,8 +164,8 @@ void Ingest::refuse(Delivery& delivery, Counter counter, std::string reason)
 {
     metrics_.add(counter);
     surroundings_.log(fmt::format("the batch {} of {} is put aside: {}", delivery.sequence, delivery.subject, reason));
-    bytes_ += delivery.payload.size();
-    held_.push_back({.delivery = std::move(delivery), .refusal = std::move(reason)});
+    taking_.bytes += delivery.payload.size();
+    taking_.batches.push_back({.delivery = std::move(delivery), .refusal = std::move(reason)});
 }
 
 void Ingest::take(Delivery delivery)
@@ -183,58 +198,50 @@ void Ingest::take(Delivery delivery)
                       fmt::format("its pseudonym {} belongs to the credential {}", batch->device, *owner));
     metrics_.add(Counter::RowsRefusedSchema, batch->badRows.size());
     for (const BadRow& row : batch->badRows)
-        bytes_ += sizeof(BadRow) + row.reason.size() + row.line.size();
-    const std::size_t source = held_.size();
-    bytes_ += delivery.payload.size();
-    const Confirmation confirmation = {credential, batch->device, batch->epoch, batch->last, delivery.isRepeated};
-    held_.push_back(
-        {.delivery = std::move(delivery), .badRows = std::move(batch->badRows), .confirmation = confirmation});
+        taking_.bytes += sizeof(BadRow) + row.reason.size() + row.line.size();
+    taking_.bytes += delivery.payload.size();
     for (const Row& row : batch->rows)
-        addRow(row, source);
-    metrics_.waitingRows = rows_;
+        taking_.add(row, limits_.rows);
+    metrics_.waitingRows += batch->rows.size();
+    const Confirmation confirmation = {credential, batch->device, batch->epoch, batch->last, delivery.isRepeated};
+    taking_.batches.push_back(
+        {.delivery = std::move(delivery), .badRows = std::move(batch->badRows), .confirmation = confirmation});
 }
 
-void Ingest::addRow(const Row& row, std::size_t source)
+bool Ingest::isStored(milliseconds wait) const
 {
-    auto place = std::ranges::find_if(blocks_, [&row, this](const TableBlock& each) {
-        return each.table == row.table && each.block.takes(row.week) && each.block.size() < limits_.rows;
-    });
-    if (place == blocks_.end())
-        place = blocks_.insert(place, {.table = row.table, .block = {}});
-    place->block.add(row.json, row.week, source);
-    ++rows_;
-    bytes_ += row.json.size();
+    return stored_.wait_for(wait) != std::future_status::timeout;
 }
 
-// A block that is stored is not stored again if something later fails.
-std::expected<void, std::string> Ingest::storeBlocks()
+// What could not be stored or answered comes first.
+void Ingest::startStoring()
 {
-    while (!blocks_.empty()) {
-        const TableBlock& next = blocks_.back();
-        const auto refused = insertBlock(database_, name(next.table), next.block);
-        metrics_.isDatabaseUp = refused.has_value();
-        if (!refused) {
-            metrics_.add(Counter::InsertFailures);
-            return std::unexpected(refused.error());
-        }
-        for (const RefusedRow& row : *refused)
-            held_[next.block.source(row.row)].badRows.push_back(
-                {row.reason, std::string(next.block.rows(row.row, row.row + 1))});
-        if (refused->size() < next.block.size())
-            metrics_.lastStored =
-                std::chrono::duration_cast<std::chrono::seconds>(std::chrono::system_clock::now().time_since_epoch())
-                    .count();
-        metrics_.add(Counter::Inserts);
-        metrics_.add(Counter::RowsRefusedDatabase, refused->size());
-        metrics_.add(storedRows(next.table), next.block.size() - refused->size());
-        rows_ -= next.block.size();
-        metrics_.waitingRows = rows_;
-        blocks_.pop_back();
+    if (storing_.batches.empty())
+        storing_ = std::exchange(taking_, {});
+    stored_ = surroundings_.start([this] { return storeBlocks(storing_, database_, metrics_); });
+}
+
+void Ingest::endStoring()
+{
+    if (const Outcome stored = answerWhatIsStored(); stored)
+        succeed();
+    else
+        fail(stored.error());
+}
+
+Outcome Ingest::answerWhatIsStored()
+{
+    if (Outcome stored = stored_.get(); !stored)
+        return stored;
+    Outcome answered = answer();
+    if (!answered) {
+        metrics_.add(Counter::StreamFailures);
+        metrics_.isStreamUp = false;
     }
-    return {};
+    return answered;
 }
 
-std::expected<void, std::string> Ingest::putAside(Held& held)
+Outcome Ingest::putAside(Held& held)
 {
     if (held.isPutAside)
         return {};
@@ -254,11 +261,11 @@ std::expected<void, std::string> Ingest::putAside(Held& held)
     return {};
 }
 
-std::expected<void, std::string> Ingest::tellDevices()
+Outcome Ingest::tellDevices()
 {
     std::vector<Confirmation> confirmations;
-    confirmations.reserve(held_.size());
-    for (const Held& held : held_)
+    confirmations.reserve(storing_.batches.size());
+    for (const Held& held : storing_.batches)
         if (held.refusal.empty())
             confirmations.push_back(held.confirmation);
     auto told = confirmations_.tell(confirmations);
@@ -267,30 +274,18 @@ std::expected<void, std::string> Ingest::tellDevices()
     return told;
 }
 
-std::expected<void, std::string> Ingest::store()
+Outcome Ingest::answer()
 {
-    if (auto stored = storeBlocks(); !stored)
-        return stored;
-    const auto answered = answer();
-    if (!answered) {
-        metrics_.add(Counter::StreamFailures);
-        metrics_.isStreamUp = false;
-    }
-    return answered;
-}
-
-std::expected<void, std::string> Ingest::answer()
-{
-    for (Held& held : held_) {
+    for (Held& held : storing_.batches) {
         if (auto put = putAside(held); !put)
             return put;
         holdOn();
     }
     if (auto told = tellDevices(); !told)
         return told;
-    for (const Held& held : held_)
+    for (const Held& held : storing_.batches)
         stream_.acknowledge(held.delivery);
-    held_.clear();
+    storing_ = {};
     return {};
 }
 
@@ -303,12 +298,10 @@ void Ingest::fail(const std::string& reason)
 
 void Ingest::succeed()
 {
-    if (pause_ != std::chrono::milliseconds{0})
+    if (pause_ != milliseconds{0})
         surroundings_.log("it goes on");
-    pause_ = std::chrono::milliseconds{0};
+    pause_ = milliseconds{0};
     nextAttempt_.reset();
-    rows_ = bytes_ = 0;
-    metrics_.waitingRows = 0;
 }
 
 } // namespace kesto_ingest

@@ -3,22 +3,23 @@
 //
 // Everything that a batch leads to is done before the batch is acknowledged, and all of it may be done twice: rows have
 // keys, dead letters and confirmations too. So a kill at any moment loses nothing.
+//
+// While the database stores one load, the next is taken: reading rows and inserting them need about as much time.
 #pragma once
 
+#include "kesto-ingest/Load.h"
 #include "kesto-ingest/Metrics.h"
-#include "kesto-ingest/batch/Batch.h"
-#include "kesto-ingest/database/Block.h"
 #include "kesto-ingest/stream/Confirmations.h"
 #include "kesto-ingest/stream/Owners.h"
 #include "kesto-ingest/stream/Stream.h"
 
-#include <array>
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
 #include <deque>
 #include <expected>
 #include <functional>
+#include <future>
 #include <optional>
 #include <string>
 #include <unordered_map>
@@ -34,13 +35,17 @@ struct IngestLimits {
     std::chrono::milliseconds longestPause{30'000};
 };
 
+// The error is for a person.
+using Outcome = std::expected<void, std::string>;
+
 struct Surroundings {
     std::function<std::chrono::steady_clock::time_point()> now;
     std::function<void(std::chrono::milliseconds)> rest;
     std::function<void(std::string_view)> log;
+    std::function<std::future<Outcome>(std::function<Outcome()>)> start; // work that another thread does
 };
 
-// One thread. What it is given must outlive it.
+// One thread; another uses the database. What it is given must outlive it.
 class Ingest {
 public:
     using Clock = std::chrono::steady_clock;
@@ -50,24 +55,12 @@ public:
     // Takes what comes, waiting a second at the most, and stores what is due. If that fails, the next attempt is due
     // after a pause.
     void turn();
-    // Stores what is held, in one attempt. If that fails, what is held goes back to the stream.
+    // Stores what is held, in one attempt. What cannot be stored goes back to the stream.
     void finish();
     // Tells the stream, now and then, that what is held is not forgotten.
     void holdOn();
 
 private:
-    struct Held {
-        Delivery delivery;
-        std::vector<BadRow> badRows{};
-        std::string refusal{}; // of the batch as a whole; empty: it is stored
-        Confirmation confirmation{};
-        bool isPutAside = false; // what is wrong with it
-    };
-    struct TableBlock {
-        Table table;
-        Block block;
-    };
-
     void takeWhatComes();
     void fetch();
     [[nodiscard]] bool isFull() const;
@@ -75,13 +68,16 @@ private:
     void giveBack(const Delivery& delivery, const std::string& device);
     void take(Delivery delivery);
     void refuse(Delivery& delivery, Counter counter, std::string reason);
-    void addRow(const Row& row, std::size_t source);
     [[nodiscard]] bool isDue() const;
-    [[nodiscard]] std::expected<void, std::string> store();
-    [[nodiscard]] std::expected<void, std::string> storeBlocks();
-    [[nodiscard]] std::expected<void, std::string> answer();
-    [[nodiscard]] std::expected<void, std::string> putAside(Held& held);
-    [[nodiscard]] std::expected<void, std::string> tellDevices();
+    [[nodiscard]] bool isStoring() const { return stored_.valid(); }
+    [[nodiscard]] bool isStored(std::chrono::milliseconds wait) const;
+    void startStoring();
+    void endStoring();
+    [[nodiscard]] Outcome answerWhatIsStored();
+    [[nodiscard]] Outcome answer();
+    [[nodiscard]] Outcome putAside(Held& held);
+    [[nodiscard]] Outcome tellDevices();
+    void giveBackAll(const Load& load);
     void fail(const std::string& reason);
     void succeed();
 
@@ -100,11 +96,9 @@ private:
 
     std::deque<Delivery> fetched_; // and not taken
     std::unordered_map<std::string, GivenBack> givenBack_; // by device: the first of its batches, for a time
-    std::vector<Held> held_;
-    std::vector<TableBlock> blocks_; // not stored
-    std::size_t rows_ = 0; // in these
-    std::size_t bytes_ = 0;
-    Clock::time_point oldest_; // when the first of `fetched_` and `held_` came
+    Load taking_;
+    Load storing_; // its blocks are the other thread's while `stored_` is awaited
+    std::future<Outcome> stored_;
     Clock::time_point heldOn_; // when the stream was told last
     std::optional<Clock::time_point> nextAttempt_; // after a failure
     std::chrono::milliseconds pause_{0};

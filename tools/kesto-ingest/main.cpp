@@ -119,11 +119,7 @@ int run(const Configuration& configuration)
     const Libraries libraries;
     Metrics metrics;
     const MetricsServer server(metrics, configuration.metricsPort);
-    Ingest* working = nullptr;
-    ClickHouse database(configuration.database, [&working] {
-        if (working != nullptr)
-            working->holdOn();
-    });
+    ClickHouse database(configuration.database);
     if (const int status = checkTables(database, configuration.database.database); status != EX_OK)
         return status;
     const auto stream = connect(configuration.stream);
@@ -131,8 +127,10 @@ int run(const Configuration& configuration)
         return EX_OK;
     Ingest ingest(*stream, database, metrics,
                   {.rows = configuration.rowsInABlock, .joining = configuration.longestJoining},
-                  {.now = std::chrono::steady_clock::now, .rest = rest, .log = log});
-    working = &ingest;
+                  {.now = std::chrono::steady_clock::now,
+                   .rest = rest,
+                   .log = log,
+                   .start = [](const std::function<Outcome()>& work) { return std::async(std::launch::async, work); }});
     metrics.isDatabaseUp = metrics.isStreamUp = true;
     log(fmt::format("ready; metrics on http://127.0.0.1:{}/metrics", server.port()));
     while (shallEnd == 0)

@@ -9,6 +9,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <future>
+
 namespace kesto_ingest {
 namespace {
 
@@ -31,8 +33,18 @@ protected:
             stream, database, metrics, limits,
             Surroundings{.now = [this] { return now; },
                          .rest = rest,
-                         .log = [this](std::string_view line) { lines.emplace_back(line); }});
+                         .log = [this](std::string_view line) { lines.emplace_back(line); },
+                         .start = [this](std::function<Outcome()> work) { return start(std::move(work)); }});
     }
+    // The other thread: it works when it is asked for the outcome, or `isSlow`, in `endWork`.
+    [[nodiscard]] std::future<Outcome> start(std::function<Outcome()> work)
+    {
+        if (!isSlow)
+            return std::async(std::launch::deferred, std::move(work));
+        slowWork = std::packaged_task<Outcome()>(std::move(work));
+        return slowWork.get_future();
+    }
+    void endWork() { slowWork(); }
     void turns(int count)
     {
         for (int turn = 0; turn < count; ++turn)
@@ -53,6 +65,8 @@ protected:
     FakeStream stream;
     FakeDatabase database;
     Metrics metrics;
+    bool isSlow = false;
+    std::packaged_task<Outcome()> slowWork;
     std::unique_ptr<Ingest> ingest = makeIngest();
 };
 
@@ -82,6 +96,81 @@ TEST_F(IngestTest, JoinsManyBatchesIntoOneInsert)
     turns(1);
     EXPECT_THAT(database.tables["events"], SizeIs(5));
     EXPECT_THAT(database.blocks, SizeIs(2)) << "one of events, one of batches";
+}
+
+TEST_F(IngestTest, TakesTheNextLoadWhileTheDatabaseStoresOne)
+{
+    isSlow = true;
+    send(deviceLine(1, 3) + eventLine(3));
+    turns(2);
+    send(deviceLine(4, 6) + eventLine(6));
+    turns(3);
+    EXPECT_EQ(metrics.count(Counter::BatchesTaken), 2U);
+    EXPECT_EQ(metrics.waitingRows.load(), 4U) << "two events and two rows of batches";
+    EXPECT_THAT(database.blocks, IsEmpty());
+    EXPECT_EQ(told(), "");
+    endWork();
+    turns(1);
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":3})") << "the other is not stored";
+    turns(1);
+    endWork();
+    turns(1);
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":6})");
+    EXPECT_THAT(database.tables["events"], SizeIs(2));
+    EXPECT_EQ(metrics.waitingRows.load(), 0U);
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+}
+
+TEST_F(IngestTest, TakesNoMoreThanOneLoadWhileTheDatabaseStoresOne)
+{
+    ingest = makeIngest({.rows = 2, .joining = milliseconds{0}});
+    isSlow = true;
+    send(deviceLine(1, 3) + eventLine(3));
+    turns(2);
+    for (int id = 4; id <= 9; ++id)
+        send(deviceLine(id, id) + eventLine(id));
+    turns(2);
+    EXPECT_EQ(metrics.count(Counter::BatchesTaken), 2U);
+    endWork();
+    turns(2);
+    endWork();
+    turns(1);
+    EXPECT_EQ(metrics.count(Counter::BatchesStored), 2U);
+}
+
+TEST_F(IngestTest, StoresNoLoadBeforeAnEarlierOneThatFailed)
+{
+    isSlow = true;
+    send(deviceLine(1, 3) + eventLine(3));
+    turns(2);
+    send(deviceLine(4, 6) + eventLine(6));
+    turns(1);
+    database.isAway = true;
+    endWork();
+    turns(1);
+    EXPECT_THAT(lines, ElementsAre("away; the next attempt is in 500 ms"));
+    database.isAway = false;
+    isSlow = false;
+    turns(2); // a pause, and the first load again
+    EXPECT_THAT(database.tables["events"], ElementsAre(HasSubstr(R"("id":3)")));
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":3})");
+    turns(1);
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":6})");
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+}
+
+TEST_F(IngestTest, WaitsForTheDatabaseBeforeItEnds)
+{
+    isSlow = true;
+    send(deviceLine(1, 3) + eventLine(3));
+    turns(2);
+    send(deviceLine(4, 6) + eventLine(6));
+    turns(1);
+    isSlow = false;
+    endWork();
+    ingest->finish();
+    EXPECT_EQ(told(), R"({"epoch":"00000000000000000000000000000001","id":6})");
+    EXPECT_EQ(stream.unacknowledged(), 0U);
 }
 
 TEST_F(IngestTest, TellsADeviceOnceOfSeveralBatches)

@@ -43,12 +43,6 @@ std::size_t keep(char* bytes, std::size_t, std::size_t count, void* text) noexce
     return count;
 }
 
-int callWait(void* wait, curl_off_t, curl_off_t, curl_off_t, curl_off_t)
-{
-    (*static_cast<std::function<void()>*>(wait))();
-    return 0;
-}
-
 } // namespace
 
 struct ClickHouse::Connection {
@@ -79,10 +73,8 @@ struct ClickHouse::Connection {
     curl_slist* headers = nullptr;
 };
 
-ClickHouse::ClickHouse(ClickHouseConfiguration configuration, std::function<void()> wait)
-    : configuration_(std::move(configuration)),
-      wait_(std::move(wait)),
-      connection_(std::make_unique<Connection>())
+ClickHouse::ClickHouse(ClickHouseConfiguration configuration)
+    : configuration_(std::move(configuration)), connection_(std::make_unique<Connection>())
 {
 }
 
@@ -113,9 +105,6 @@ ClickHouse::Answer ClickHouse::askServer(const std::string& server, const std::s
     set(CURLOPT_WRITEFUNCTION, keep);
     set(CURLOPT_WRITEDATA, &answer.text);
     set(CURLOPT_ERRORBUFFER, error.data());
-    set(CURLOPT_NOPROGRESS, 0L);
-    set(CURLOPT_XFERINFOFUNCTION, callWait);
-    set(CURLOPT_XFERINFODATA, &wait_);
     if (!configuration_.user.empty()) {
         set(CURLOPT_HTTPAUTH, static_cast<long>(CURLAUTH_BASIC));
         set(CURLOPT_USERNAME, configuration_.user.c_str());

@@ -5,7 +5,6 @@
 #include "kesto-ingest/database/Database.h"
 
 #include <chrono>
-#include <functional>
 #include <map>
 #include <memory>
 #include <string>
@@ -27,8 +26,7 @@ struct ClickHouseConfiguration {
 
 class ClickHouse : public Database {
 public:
-    // `wait` is called about once a second while a server has not answered.
-    ClickHouse(ClickHouseConfiguration configuration, std::function<void()> wait);
+    explicit ClickHouse(ClickHouseConfiguration configuration);
     ~ClickHouse() override;
 
     // Goes to the next server if one cannot be used, until each was tried.
@@ -46,7 +44,6 @@ private:
     [[nodiscard]] Answer askServer(const std::string& server, const std::string& query, std::string_view body);
 
     ClickHouseConfiguration configuration_;
-    std::function<void()> wait_;
     std::unique_ptr<Connection> connection_;
     std::size_t current_ = 0; // the server that answered last
 };

@@ -58,7 +58,7 @@ public:
 
 private:
     // The first server is away at any time; what the second keeps must not go to the third, too.
-    ClickHouse database_{{.servers = {"http://127.0.0.1:1", server.address(), server.address()}}, [] { }};
+    ClickHouse database_{{.servers = {"http://127.0.0.1:1", server.address(), server.address()}}};
 };
 
 std::unique_ptr<DatabaseProvider> makeProvider(const std::string& name)
