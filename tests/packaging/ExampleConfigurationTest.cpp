@@ -8,7 +8,9 @@
 #include "platform/linux/store/SqliteConnection.h"
 #include "platform/linux/store/applications/ApplicationRules.h"
 #include "platform/linux/store/tables/StoreSchema.h"
+#include "support/ManualPage.h"
 
+#include <filesystem>
 #include <fstream>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
@@ -22,6 +24,8 @@ namespace {
 
 using foundation::Dictionary;
 using foundation::Value;
+using support::findAll;
+using support::keysOnPage;
 using testing::ElementsAre;
 using testing::ElementsAreArray;
 using testing::IsEmpty;
@@ -78,41 +82,31 @@ TEST(ExampleConfiguration, LimitsShowEveryDefaultAndTheMostMemory)
 
 // --- the manual pages
 
-// What the expression finds in its first parentheses.
-std::vector<std::string> findAll(const std::string& text, const std::string& expression)
+std::filesystem::path page(const std::string& name)
 {
-    const std::regex wanted(expression);
-    return {std::sregex_token_iterator(text.begin(), text.end(), wanted, 1), {}};
-}
-
-// The keys that a page describes.
-std::vector<std::string> keysOnPage(const std::string& name)
-{
-    return findAll(textOf("../man/" + name), "\n\\.It Ic ([A-Za-z_-]+) No = ");
+    return std::filesystem::path(KESTO_EXAMPLES) / "../man" / name;
 }
 
 // The keys that the service knows, as it names them when it meets another one.
 std::vector<std::string> keysIn(const std::vector<std::string>& problems)
 {
     EXPECT_EQ(problems.size(), 1U);
-    const std::string list = std::regex_replace(problems.at(0), std::regex(".*; the keys are "), "");
-    const std::regex separator(", ");
-    return {std::sregex_token_iterator(list.begin(), list.end(), separator, -1), {}};
+    return support::keysIn(problems.at(0));
 }
 
 TEST(ManualPages, DescribeEveryKey)
 {
     const Dictionary unknown = {{"no-such-key", true}};
-    EXPECT_THAT(keysOnPage("kesto-analytics.toml.5"),
+    EXPECT_THAT(keysOnPage(page("kesto-analytics.toml.5")),
                 UnorderedElementsAreArray(keysIn(readAnalyticsConfiguration(unknown).problems)));
-    EXPECT_THAT(keysOnPage("kesto-applications.toml.5"),
+    EXPECT_THAT(keysOnPage(page("kesto-applications.toml.5")),
                 UnorderedElementsAreArray(keysIn(readApplicationsConfiguration(unknown).problems)));
-    EXPECT_THAT(keysOnPage("kesto-limits.toml.5"),
+    EXPECT_THAT(keysOnPage(page("kesto-limits.toml.5")),
                 UnorderedElementsAreArray(keysIn(readMemoryLimits(unknown, 0).problems)));
     // Of these files the service reads single keys: the examples are tested to have the same ones.
-    EXPECT_THAT(keysOnPage("kesto-device.toml.5"), ElementsAre("InternalBuild"));
-    EXPECT_THAT(keysOnPage("kesto-feature-flags.toml.5"), ElementsAre("Tracing"));
-    EXPECT_THAT(keysOnPage("kesto-preferences.5"),
+    EXPECT_THAT(keysOnPage(page("kesto-device.toml.5")), ElementsAre("InternalBuild"));
+    EXPECT_THAT(keysOnPage(page("kesto-feature-flags.toml.5")), ElementsAre("Tracing"));
+    EXPECT_THAT(keysOnPage(page("kesto-preferences.5")),
                 ElementsAre("device_name", "disable_reporting", "spatial-audio-accessory-feature"));
 }
 

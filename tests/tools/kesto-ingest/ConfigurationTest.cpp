@@ -2,6 +2,7 @@
 // What ingest.toml may say, and what is said of one that is wrong.
 #include "kesto-ingest/Configuration.h"
 
+#include "support/ManualPage.h"
 #include "support/TemporaryDirectory.h"
 
 #include <gtest/gtest.h>
@@ -45,6 +46,15 @@ TEST_F(IngestConfiguration, TheExampleShowsEveryDefault)
     const auto example = readConfiguration(KESTO_INGEST_EXAMPLE);
     ASSERT_TRUE(example) << example.error();
     EXPECT_EQ(*example, Configuration());
+}
+
+TEST_F(IngestConfiguration, TheManualPageDescribesEveryKey)
+{
+    std::vector<std::string> known;
+    for (const std::string table : {"stream", "database", "batches", "metrics"})
+        for (const std::string& key : support::keysIn(problem("[" + table + "]\nno_such_key = 1\n")))
+            known.push_back(key);
+    EXPECT_EQ(support::keysOnPage(KESTO_INGEST_MANUAL), known);
 }
 
 TEST_F(IngestConfiguration, IsRead)

@@ -2,6 +2,7 @@
 // What uplink.toml may say, and what the uplink says about a wrong one.
 #include "kesto-uplink/rules/UplinkConfiguration.h"
 
+#include "support/ManualPage.h"
 #include "support/TemporaryDirectory.h"
 
 #include <fstream>
@@ -14,6 +15,7 @@ namespace kesto_uplink {
 namespace {
 
 using testing::ElementsAre;
+using testing::ElementsAreArray;
 using testing::IsEmpty;
 using testing::SizeIs;
 using testing::StartsWith;
@@ -244,6 +246,17 @@ TEST(UplinkConfiguration, ReadsItsExample)
     EXPECT_THAT(whole.configuration.allowed.events[0].rules, SizeIs(3));
     EXPECT_THAT(*whole.configuration.allowed.stretches, SizeIs(3));
     EXPECT_THAT(*whole.configuration.allowed.sessions, SizeIs(2));
+}
+
+TEST(UplinkConfiguration, TheManualPageDescribesEveryKey)
+{
+    const auto unknown = parse("no_such_key = 1\n[device]\nno_such_key = 1\n");
+    ASSERT_THAT(unknown.problems, SizeIs(2));
+    std::vector<std::string> known = support::keysIn(unknown.problems[0]);
+    std::erase_if(known, [](const std::string& key) { return key.contains('['); }); // tables
+    for (const std::string& key : support::keysIn(unknown.problems[1]))
+        known.push_back(key);
+    EXPECT_THAT(support::keysOnPage(KESTO_EXAMPLES "/../man/kesto-uplink.toml.5"), ElementsAreArray(known));
 }
 
 } // namespace
