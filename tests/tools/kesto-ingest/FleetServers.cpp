@@ -1,18 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
 // The scripts of packaging/fleet start the servers; their processes become the servers.
-//
-// nats-server chooses a free port itself. ClickHouse cannot: if another program was faster, it ends, and is started
-// with other ports.
 #include "tools/kesto-ingest/FleetServers.h"
 
 #include "kesto-ingest/database/Tables.h"
 #include "platform/linux/files/FileDescriptor.h"
 
 #include <curl/curl.h>
-#include <gtest/gtest.h>
+#include <fmt/format.h>
+#include <fmt/ranges.h>
 
-#include <arpa/inet.h>
-#include <netinet/in.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
 
@@ -40,18 +36,21 @@ bool hasEnded(const sdk_test::Process& process)
     return ended.si_pid != 0;
 }
 
-// The kernel chooses a port of 127.0.0.1. Another program may take it before the server does.
-std::uint16_t freePort()
+bool takesConnections(std::uint16_t port)
 {
     const platform::FileDescriptor made(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    socklen_t size = sizeof address;
-    if (::bind(made.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) != 0
-        || ::getsockname(made.get(), reinterpret_cast<sockaddr*>(&address), &size) != 0)
-        throw std::runtime_error("no free port");
-    return ntohs(address.sin_port);
+    const sockaddr_in address = support::loopback(port);
+    return ::connect(made.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0;
+}
+
+void awaitStart(const sdk_test::Process& process, const std::string& name, const std::filesystem::path& output,
+                const std::function<bool()>& isReady)
+{
+    waitUntil(name + " answers", [&] {
+        if (hasEnded(process))
+            throw std::runtime_error(name + " does not start: " + support::readFile(output) + process.errors());
+        return isReady();
+    });
 }
 
 } // namespace
@@ -91,20 +90,29 @@ void waitUntil(const std::string& what, const std::function<bool()>& holds)
 }
 
 NatsServer::NatsServer(const std::filesystem::path& directory)
-    : process_(startScript({"start-nats", directory, "-1", std::string(KESTO_FLEET) + "/accounts.conf"}))
+    : NatsServer(directory, std::filesystem::path(KESTO_FLEET) / "accounts.conf")
 {
-    const auto file = directory / ("nats-server_" + std::to_string(process_->identifier()) + ".ports");
-    constexpr std::string_view before = "127.0.0.1:";
-    waitUntil("nats-server tells its port", [&] {
-        if (hasEnded(*process_))
-            throw std::runtime_error("nats-server does not start: " + support::readFile(directory / "output"));
-        const std::string text = std::filesystem::exists(file) ? support::readFile(file) : "";
-        const auto place = text.find(before);
-        if (place == std::string::npos || !text.contains('}'))
-            return false;
-        port_ = static_cast<std::uint16_t>(std::stoi(text.substr(place + before.size())));
-        return true;
-    });
+}
+
+NatsServer::NatsServer(std::filesystem::path directory, std::filesystem::path accounts, std::uint16_t clusterPort,
+                       std::vector<std::uint16_t> routes)
+    : directory_(std::move(directory)),
+      accounts_(std::move(accounts)),
+      clusterPort_(clusterPort),
+      routes_(std::move(routes))
+{
+    start();
+}
+
+void NatsServer::start()
+{
+    sdk_test::Process::Arguments arguments{"start-nats", directory_, std::to_string(port_.number()), accounts_};
+    if (clusterPort_ != 0) {
+        arguments.push_back(std::to_string(clusterPort_));
+        arguments.push_back(fmt::format("{}", fmt::join(routes_, ",")));
+    }
+    process_ = startScript(arguments);
+    awaitStart(*process_, "nats-server", directory_ / "output", [this] { return takesConnections(port_.number()); });
 }
 
 void NatsServer::end()
@@ -112,26 +120,41 @@ void NatsServer::end()
     process_.reset();
 }
 
-ClickHouseServer::ClickHouseServer(std::filesystem::path directory) : directory_(std::move(directory))
+ZooKeeperServer::ZooKeeperServer(const std::filesystem::path& directory)
+    : process_(startScript({"start-zookeeper", directory, std::to_string(port_.number())}))
 {
-    std::filesystem::create_directories(directory_);
+    awaitStart(*process_, "ZooKeeper", directory / "output", [this] { return takesConnections(port_.number()); });
+}
+
+ClickHouseServer::ClickHouseServer(std::filesystem::path directory)
+    : directory_(std::move(directory)),
+      arguments_{"start-clickhouse", directory_, std::to_string(port()), std::to_string(ownTCPPort_.number())}
+{
+    start();
+}
+
+ClickHouseServer::ClickHouseServer(std::filesystem::path directory, std::uint16_t tcpPort, const Membership& membership)
+    : directory_(std::move(directory)),
+      arguments_{"start-clickhouse",
+                 directory_,
+                 std::to_string(port()),
+                 std::to_string(tcpPort),
+                 std::to_string(interserverPort_.number()),
+                 membership.zookeeper,
+                 std::to_string(membership.shard),
+                 std::to_string(membership.replica),
+                 membership.cluster}
+{
     start();
 }
 
 void ClickHouseServer::start()
 {
-    constexpr int mostAttempts = 5;
-    for (int attempt = 0; attempt < mostAttempts; ++attempt) {
-        port_ = freePort();
-        process_ = startScript({"start-clickhouse", directory_, std::to_string(port_), std::to_string(freePort())});
-        waitUntil("ClickHouse answers", [this] { return hasEnded(*process_) || isReady(); });
-        if (!hasEnded(*process_))
-            return;
-    }
-    throw std::runtime_error("ClickHouse does not start: " + support::readFile(directory_ / "errors"));
+    std::filesystem::create_directories(directory_);
+    process_ = startScript(arguments_);
+    awaitStart(*process_, "ClickHouse", directory_ / "errors", [this] { return isReady(); });
 }
 
-// Another server may have been faster to take the port.
 bool ClickHouseServer::isReady() const
 {
     return ask(address() + "/", "SELECT data_path FROM system.databases WHERE name = 'default'")
@@ -143,14 +166,16 @@ void ClickHouseServer::end()
     process_.reset();
 }
 
-void ClickHouseServer::makeTables() const
+void ClickHouseServer::makeTables(const std::string& cluster) const
 {
     std::string statement;
-    for (const char character : tablesSql("kesto", "")) {
+    for (const char character : tablesSql("kesto", cluster)) {
         statement += character;
         if (character == ';') {
             statement.pop_back();
-            EXPECT_EQ(ask(address() + "/", statement), "");
+            const std::string answer = ask(address() + "/", statement);
+            if (answer.contains("Exception") || answer.starts_with("no answer"))
+                throw std::runtime_error("ClickHouse does not make the tables: " + answer);
             statement.clear();
         }
     }

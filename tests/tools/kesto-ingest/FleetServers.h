@@ -1,8 +1,11 @@
 // SPDX-License-Identifier: Apache-2.0
-// A real nats-server and a real ClickHouse of a test's own, on loopback, in a directory of their own.
+// Real servers of a test's own, on loopback, in directories of their own: nats-server and ClickHouse, alone or as
+// members of a cluster, and ZooKeeper. Each keeps its ports while it is away, and ends with the test, even if that is
+// killed.
 #pragma once
 
 #include "sdk/Process.h"
+#include "support/KeptPort.h"
 #include "support/TemporaryDirectory.h"
 
 #include <chrono>
@@ -10,6 +13,7 @@
 #include <functional>
 #include <memory>
 #include <string>
+#include <vector>
 
 namespace kesto_ingest {
 
@@ -19,36 +23,69 @@ namespace kesto_ingest {
 // Throws if the condition does not hold in time.
 void waitUntil(const std::string& what, const std::function<bool()>& holds);
 
-// Ends with the test, even if that is killed.
 class NatsServer {
 public:
+    // The accounts are those of packaging/fleet, unless others are given.
     explicit NatsServer(const std::filesystem::path& directory);
+    // One of a cluster: its port for the others, and the ports of all. It is ready when a client is served.
+    NatsServer(std::filesystem::path directory, std::filesystem::path accounts, std::uint16_t clusterPort = 0,
+               std::vector<std::uint16_t> routes = {});
 
+    void start(); // again
     void end(); // at once
-    [[nodiscard]] std::string address() const { return "nats://127.0.0.1:" + std::to_string(port_); }
+    [[nodiscard]] std::string address() const { return "nats://127.0.0.1:" + std::to_string(port_.number()); }
+    [[nodiscard]] std::string name() const { return "nats-" + std::to_string(port_.number()); } // in the cluster
 
 private:
+    const std::filesystem::path directory_;
+    const std::filesystem::path accounts_;
+    const std::uint16_t clusterPort_;
+    const std::vector<std::uint16_t> routes_;
+    const support::KeptPort port_;
     std::unique_ptr<sdk_test::Process> process_;
-    std::uint16_t port_ = 0;
+};
+
+class ZooKeeperServer {
+public:
+    explicit ZooKeeperServer(const std::filesystem::path& directory);
+
+    [[nodiscard]] std::string address() const { return "127.0.0.1:" + std::to_string(port_.number()); }
+
+private:
+    const support::KeptPort port_;
+    std::unique_ptr<sdk_test::Process> process_;
 };
 
 class ClickHouseServer {
 public:
-    explicit ClickHouseServer(std::filesystem::path directory);
+    // Where a server stands in a cluster, as start-clickhouse takes it.
+    struct Membership {
+        std::string zookeeper;
+        int shard = 1;
+        int replica = 1;
+        std::string cluster; // the TCP ports of all
+    };
 
-    void start(); // perhaps on another port than before
+    explicit ClickHouseServer(std::filesystem::path directory); // alone
+    ClickHouseServer(std::filesystem::path directory, std::uint16_t tcpPort, const Membership& membership);
+
+    void start(); // again
     void end(); // at once, without a chance to finish
-    void makeTables() const;
-    [[nodiscard]] std::string address() const { return "http://127.0.0.1:" + std::to_string(port_); }
-    [[nodiscard]] std::uint16_t port() const { return port_; }
+    void makeTables(const std::string& cluster = {}) const;
+    [[nodiscard]] std::string address() const { return "http://127.0.0.1:" + std::to_string(port()); }
+    [[nodiscard]] std::uint16_t port() const { return port_.number(); }
     // Without the end of the last line.
     [[nodiscard]] std::string select(const std::string& query) const;
+    [[nodiscard]] pid_t process() const { return process_->identifier(); }
 
 private:
     [[nodiscard]] bool isReady() const;
 
-    std::filesystem::path directory_;
-    std::uint16_t port_ = 0;
+    const std::filesystem::path directory_;
+    const support::KeptPort port_;
+    const support::KeptPort ownTCPPort_;
+    const support::KeptPort interserverPort_;
+    sdk_test::Process::Arguments arguments_;
     std::unique_ptr<sdk_test::Process> process_;
 };
 

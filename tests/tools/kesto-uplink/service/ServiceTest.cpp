@@ -6,7 +6,7 @@
 #include "kesto-uplink/state/State.h"
 #include "support/MessageKinds.h"
 #include "support/ParseJson.h"
-#include "tools/kesto-uplink/service/HoldingProxy.h"
+#include "support/Relay.h"
 #include "tools/kesto-uplink/service/UplinkProcess.h"
 #include "tools/kesto-uplink/transport/NatsServer.h"
 
@@ -39,7 +39,12 @@ using Keys = std::multiset<std::string>;
 
 class UplinkService : public testing::Test {
 protected:
-    UplinkService() { kestod.startAndAwait(); }
+    // The stream has the first batch, and the device does not know it.
+    UplinkService()
+    {
+        proxy.loseAnswersWith(R"("stream":"KESTO")");
+        kestod.startAndAwait();
+    }
 
     // So many new events in the store.
     void report(int count)
@@ -125,9 +130,10 @@ protected:
     }
 
     NatsServer nats;
-    HoldingProxy proxy{nats.port()};
+    support::Relay proxy{nats.port()};
     Kestod kestod;
-    UplinkProcess uplink{kestod.directory() / "state" / "analytics.sqlite3", proxy.url()};
+    UplinkProcess uplink{kestod.directory() / "state" / "analytics.sqlite3",
+                         fmt::format("nats://127.0.0.1:{}", proxy.port())};
 
 private:
     int sessions_ = 0;
@@ -138,12 +144,12 @@ TEST_F(UplinkService, WhatIsAllowedIsInTheStreamOnceWhateverIsKilled)
     // Killed behind the stream's answer, before the device noted it.
     report(3);
     uplink.start();
-    ASSERT_TRUE(waitUntil([this] { return proxy.isHolding(); }));
+    ASSERT_TRUE(waitUntil([this] { return proxy.hasLostAnAnswer(); }));
     uplink.signal(SIGKILL);
     EXPECT_EQ(uplink.exitStatus(), -SIGKILL);
     EXPECT_EQ(kesto_uplink::State::openPresent(uplink.state())->queued(), kesto_uplink::Cursor());
     EXPECT_EQ(messageIDs().size(), 1U);
-    proxy.holdNoMore();
+    proxy.loseNothing();
     uplink.start();
     ASSERT_TRUE(isAllQueued());
     EXPECT_EQ(messageIDs().size(), 1U);
@@ -179,7 +185,7 @@ TEST_F(UplinkService, TheDeviceForgetsWhatTheFleetsStoreHas)
     std::string configuration = support::readFile(uplink.state() / "uplink.toml");
     configuration.replace(configuration.find("queued"), 6, "stored");
     uplink.writeConfiguration(configuration);
-    proxy.holdNoMore();
+    proxy.loseNothing();
     report(5);
     uplink.start();
     ASSERT_TRUE(isAllQueued());
@@ -199,7 +205,7 @@ TEST_F(UplinkService, TheDeviceForgetsWhatTheFleetsStoreHas)
 // and receivers know its rows by their keys.
 TEST_F(UplinkService, KillsAtRandomLoseNothing)
 {
-    proxy.holdNoMore();
+    proxy.loseNothing();
     std::mt19937 random(7);
     for (int kill = 0; kill < 8; ++kill) {
         report(5);
@@ -223,7 +229,7 @@ TEST_F(UplinkService, ASignalEndsItAlsoWhileItWaitsForAnAnswer)
 {
     report(5);
     uplink.start();
-    ASSERT_TRUE(waitUntil([this] { return proxy.isHolding(); }));
+    ASSERT_TRUE(waitUntil([this] { return proxy.hasLostAnAnswer(); }));
     uplink.signal(SIGTERM);
     EXPECT_EQ(uplink.exitStatus(), 0);
     EXPECT_EQ(kesto_uplink::State::openPresent(uplink.state())->queued(), kesto_uplink::Cursor());
@@ -240,7 +246,7 @@ TEST_F(UplinkService, WithoutEnabledItSaysSoAndEnds)
 
 TEST_F(UplinkService, AChangeOfItsFilesCountsFromTheNextRoundOn)
 {
-    proxy.holdNoMore();
+    proxy.loseNothing();
     report(5);
     uplink.start();
     ASSERT_TRUE(isAllQueued());

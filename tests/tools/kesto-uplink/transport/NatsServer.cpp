@@ -6,10 +6,8 @@
 #include <csignal>
 #include <fcntl.h>
 #include <fmt/format.h>
-#include <netinet/in.h>
 #include <stdexcept>
 #include <sys/prctl.h>
-#include <sys/socket.h>
 #include <sys/wait.h>
 #include <thread>
 #include <unistd.h>
@@ -54,7 +52,6 @@ NatsServer::NatsServer(const Setup& setup) : hasTLS_(!setup.tls.empty())
                        fmt::format("server_name: test\nports_file_dir: \"{}\"\nmax_payload: 600KB\n"
                                    "jetstream {{ store_dir: \"{}/streams\", max_mem: 64M, max_file: 256M }}\n{}{}",
                                    path, path, hasTLS_ ? fmt::format("tls {{\n{}\n}}\n", setup.tls) : "", accounts));
-    keepPort();
     start();
     if (!setup.hasStreams)
         return;
@@ -85,28 +82,11 @@ NatsServer::~NatsServer()
     kill();
 }
 
-// The server shares the port with this socket, since both reuse addresses and this one does not listen.
-void NatsServer::keepPort()
-{
-    portKeeper_ = platform::FileDescriptor(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0));
-    const int yes = 1;
-    sockaddr_in address{};
-    address.sin_family = AF_INET;
-    address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-    socklen_t size = sizeof address;
-    const bool isKept = ::setsockopt(portKeeper_.get(), SOL_SOCKET, SO_REUSEADDR, &yes, sizeof yes) == 0
-        && ::bind(portKeeper_.get(), reinterpret_cast<sockaddr*>(&address), size) == 0
-        && ::getsockname(portKeeper_.get(), reinterpret_cast<sockaddr*>(&address), &size) == 0;
-    if (!isKept)
-        throw std::runtime_error("no port on loopback is free");
-    port_ = ntohs(address.sin_port);
-}
-
 void NatsServer::start()
 {
     const std::string configuration = directory_ / "node.conf";
     const std::string log = directory_ / "log";
-    const std::string port = std::to_string(port_);
+    const std::string port = std::to_string(port());
     process_ = ::fork();
     if (process_ == 0) {
         ::prctl(PR_SET_PDEATHSIG, SIGKILL);
@@ -152,7 +132,7 @@ void NatsServer::goOn()
 
 std::string NatsServer::url(const std::string& scheme, const std::string& host) const
 {
-    return fmt::format("{}://{}:{}", scheme, host, port_);
+    return fmt::format("{}://{}:{}", scheme, host, port());
 }
 
 void NatsServer::asAdministrator(const std::function<void(natsConnection*, jsCtx*)>& work)

@@ -1,11 +1,10 @@
 // SPDX-License-Identifier: Apache-2.0
 // A real nats-server on loopback, with the streams and accounts that a fleet has, in a directory of its own.
 //
-// A socket that never listens keeps its port as long as the object lives, so that it comes back where its clients look
-// for it, and no other program gets the port meanwhile.
+// It keeps its port as long as the object lives, so that it comes back where its clients look for it.
 #pragma once
 
-#include "platform/linux/files/FileDescriptor.h"
+#include "support/KeptPort.h"
 #include "support/TemporaryDirectory.h"
 
 #include <nats/nats.h>
@@ -46,7 +45,7 @@ public:
     void freeze();
     void goOn();
 
-    [[nodiscard]] int port() const { return port_; }
+    [[nodiscard]] std::uint16_t port() const { return port_.number(); }
     [[nodiscard]] std::string url(const std::string& scheme = "nats", const std::string& host = "127.0.0.1") const;
 
     // Each of these connects with all rights, without encryption.
@@ -56,13 +55,11 @@ public:
     [[nodiscard]] std::vector<StoredMessage> stored(); // in the stream KESTO, in order
 
 private:
-    void keepPort();
     void asAdministrator(const std::function<void(natsConnection*, jsCtx*)>& work);
 
     const support::TemporaryDirectory directory_;
     bool hasTLS_ = false;
-    platform::FileDescriptor portKeeper_;
-    int port_ = 0;
+    const support::KeptPort port_;
     pid_t process_ = 0;
 };
 
