@@ -4,6 +4,7 @@
 #include "kesto-uplink/outbox/Outbox.h"
 
 #include "kesto-uplink/outbox/Compression.h"
+#include "platform/linux/store/tables/SkippedIDs.h"
 
 #include <algorithm>
 #include <fmt/format.h>
@@ -129,7 +130,7 @@ std::optional<Outbox::Draft> Outbox::collect(const Cursor& after, std::int64_t m
         place = {draft->after.epoch, draft->last};
     }
     if (draft)
-        draft->leftOut.lostToAge = draft->last - draft->after.id - draft->seen;
+        draft->leftOut.lostToAge = platform::removedOf(draft->last - draft->after.id - draft->seen);
     return draft;
 }
 

@@ -129,6 +129,23 @@ TEST_F(UplinkOutbox, NamesWhatCannotLeave)
     EXPECT_EQ(batch->progress().notAllowed, 2);
 }
 
+TEST_F(UplinkOutbox, DoesNotCountTheNumbersThatTheStoreSkippedAfterALossOfPower)
+{
+    MadeEventStore store(database);
+    for (int count = 0; count < 10; ++count)
+        store.addEvent(start);
+    store.execute("UPDATE store SET next_event = next_event + 1000000000");
+    store.addEvent(start);
+    EXPECT_EQ(next(4)->leftOut.lostToAge, 0);
+    EXPECT_EQ(next(4)->rows, 7);
+    EXPECT_EQ(next(14)->leftOut.lostToAge, 0) << "four that were read are lost";
+    EXPECT_EQ(next(14)->last.id, 1'000'000'011);
+    store.execute("DELETE FROM messages WHERE id < 4");
+    store.execute("UPDATE store SET next_event = next_event + 1000000000");
+    store.addEvent(start);
+    EXPECT_EQ(next(1)->leftOut.lostToAge, 2) << "the second and the third";
+}
+
 TEST_F(UplinkOutbox, CountsWhatAgedOutBeforeItWasRead)
 {
     MadeEventStore store(database);

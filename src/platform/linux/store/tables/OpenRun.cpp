@@ -2,6 +2,8 @@
 // The run of the machine is known by the kernel's random boot ID.
 #include "platform/linux/store/tables/OpenRun.h"
 
+#include "platform/linux/store/tables/SkippedIDs.h"
+
 namespace platform {
 
 StoreExpected<> OpenRun::begin(SqliteConnection& connection, std::string_view bootIdentifier, double now,

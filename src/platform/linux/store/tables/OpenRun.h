@@ -12,10 +12,6 @@ namespace platform {
 
 class OpenRun {
 public:
-    // Far more than one log can hold.
-    static constexpr std::int64_t skippedEvents = 1'000'000'000;
-    static constexpr std::int64_t skippedOrigins = 1'000'000; // sources, and sessions
-
     // Inside a transaction that must reach the disk: notes this run, and skips IDs if another run of the machine did
     // not close the database.
     [[nodiscard]] static StoreExpected<> begin(SqliteConnection& connection, std::string_view bootIdentifier,
