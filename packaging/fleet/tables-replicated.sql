@@ -25,6 +25,7 @@ CREATE TABLE IF NOT EXISTS kesto.events_local ON CLUSTER fleet (
     device FixedString(32), -- the pseudonym
     epoch FixedString(32), -- of the device's store: IDs mean something only with it
     id UInt64,
+    happened_us Int64, -- microseconds since 1970 UTC: when it happened, or else `time`
     time Float64, -- when it was sent, by the device's clock
     happened Nullable(Float64), -- when it happened, if told
     name String,
@@ -37,7 +38,7 @@ CREATE TABLE IF NOT EXISTS kesto.events_local ON CLUSTER fleet (
     late_cycles Float64 DEFAULT visitParamExtractFloat(payload, 'late_cycles'),
     received DateTime DEFAULT now() -- when it was stored here
 ) ENGINE = ReplicatedReplacingMergeTree('/clickhouse/tables/{shard}/kesto/events', '{replica}')
-PARTITION BY toMonday(toDateTime(toUInt32(time)))
+PARTITION BY toMonday(toDateTime(intDiv(happened_us, 1000000)))
 ORDER BY (device, epoch, id);
 
 CREATE TABLE IF NOT EXISTS kesto.events ON CLUSTER fleet AS kesto.events_local
@@ -49,21 +50,24 @@ CREATE TABLE IF NOT EXISTS kesto.stretches_local ON CLUSTER fleet (
     epoch FixedString(32), -- of the device's store: IDs mean something only with it
     id UInt64,
     recording UInt8, -- 0: it played
-    began Float64,
-    seconds Float64,
+    began_us Int64, -- microseconds since 1970 UTC. Whole numbers add up to the same in any order
+    microseconds Int64, -- how long
+    began Float64 DEFAULT began_us / 1000000, -- in seconds, as the next two
+    seconds Float64 DEFAULT microseconds / 1000000,
     played_seconds Float64 DEFAULT if(recording, 0, seconds),
     session UInt64, -- an ID in sessions, or 0: it belongs to none
     application String, -- empty: not known
     audio_device String, -- empty: not known, as in the next
     format String,
     channels Nullable(UInt32),
-    volume Nullable(Float64),
+    volume_millionths Nullable(UInt32), -- 0: muted, 1000000: all of the slider
+    volume Nullable(Float64) DEFAULT volume_millionths / 1000000, -- from 0 to 1
     ending String,
     model String, -- of the device
     version String, -- the device's release
     received DateTime DEFAULT now() -- when it was stored here
 ) ENGINE = ReplicatedReplacingMergeTree('/clickhouse/tables/{shard}/kesto/stretches', '{replica}')
-PARTITION BY toMonday(toDateTime(toUInt32(began)))
+PARTITION BY (toMonday(toDateTime(intDiv(began_us, 1000000))), microseconds > 86400000000)
 ORDER BY (device, epoch, id);
 
 CREATE TABLE IF NOT EXISTS kesto.stretches ON CLUSTER fleet AS kesto.stretches_local

@@ -22,6 +22,7 @@ CREATE TABLE IF NOT EXISTS kesto.events (
     device FixedString(32), -- the pseudonym
     epoch FixedString(32), -- of the device's store: IDs mean something only with it
     id UInt64,
+    happened_us Int64, -- microseconds since 1970 UTC: when it happened, or else `time`
     time Float64, -- when it was sent, by the device's clock
     happened Nullable(Float64), -- when it happened, if told
     name String,
@@ -34,7 +35,7 @@ CREATE TABLE IF NOT EXISTS kesto.events (
     late_cycles Float64 DEFAULT visitParamExtractFloat(payload, 'late_cycles'),
     received DateTime DEFAULT now() -- when it was stored here
 ) ENGINE = ReplacingMergeTree()
-PARTITION BY toMonday(toDateTime(toUInt32(time)))
+PARTITION BY toMonday(toDateTime(intDiv(happened_us, 1000000)))
 ORDER BY (device, epoch, id);
 
 -- who played or recorded for how long
@@ -43,21 +44,24 @@ CREATE TABLE IF NOT EXISTS kesto.stretches (
     epoch FixedString(32), -- of the device's store: IDs mean something only with it
     id UInt64,
     recording UInt8, -- 0: it played
-    began Float64,
-    seconds Float64,
+    began_us Int64, -- microseconds since 1970 UTC. Whole numbers add up to the same in any order
+    microseconds Int64, -- how long
+    began Float64 DEFAULT began_us / 1000000, -- in seconds, as the next two
+    seconds Float64 DEFAULT microseconds / 1000000,
     played_seconds Float64 DEFAULT if(recording, 0, seconds),
     session UInt64, -- an ID in sessions, or 0: it belongs to none
     application String, -- empty: not known
     audio_device String, -- empty: not known, as in the next
     format String,
     channels Nullable(UInt32),
-    volume Nullable(Float64),
+    volume_millionths Nullable(UInt32), -- 0: muted, 1000000: all of the slider
+    volume Nullable(Float64) DEFAULT volume_millionths / 1000000, -- from 0 to 1
     ending String,
     model String, -- of the device
     version String, -- the device's release
     received DateTime DEFAULT now() -- when it was stored here
 ) ENGINE = ReplacingMergeTree()
-PARTITION BY toMonday(toDateTime(toUInt32(began)))
+PARTITION BY (toMonday(toDateTime(intDiv(began_us, 1000000))), microseconds > 86400000000)
 ORDER BY (device, epoch, id);
 
 -- of the devices' clients

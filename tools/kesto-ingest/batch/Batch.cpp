@@ -2,10 +2,12 @@
 // Cuts a batch into lines, and writes each good row with the columns of its table, and the device's model and version.
 #include "kesto-ingest/batch/Batch.h"
 
+#include "foundation/values/Microseconds.h"
 #include "kesto-ingest/batch/Compression.h"
 #include "kesto-ingest/batch/RowReader.h"
 
-#include <charconv>
+#include <algorithm>
+#include <cstdint>
 #include <fmt/format.h>
 #include <iterator>
 
@@ -34,6 +36,20 @@ void appendText(std::string_view text, std::string& json)
     json += '"';
 }
 
+void appendWhole(std::int64_t number, std::string& json)
+{
+    fmt::format_to(std::back_inserter(json), "{}", number);
+}
+
+// What a partition, and a column of moments, can express.
+double momentOf(const RowReader& row)
+{
+    const RowKind& kind = row.kind();
+    const double moment = row.number(kind.moment);
+    const bool isKnown = row.find(kind.moment) != nullptr && moment >= 0 && moment <= latestMoment;
+    return isKnown ? moment : row.number(kind.otherMoment);
+}
+
 void appendColumn(const Field& field, const RowReader& row, std::string& json)
 {
     const RowEntry* const entry = row.find(field.key);
@@ -45,10 +61,13 @@ void appendColumn(const Field& field, const RowReader& row, std::string& json)
     switch (field.type) {
     case FieldType::Moment:
     case FieldType::Number:
-    case FieldType::Length:
     case FieldType::Identity:
     case FieldType::Integer:
     case FieldType::Count: json += entry->text; break;
+    case FieldType::Length: appendWhole(foundation::wholeMicroseconds(row.number(field.key)), json); break;
+    case FieldType::Share:
+        appendWhole(foundation::wholeMillionths(std::clamp(row.number(field.key), 0.0, 1.0)), json);
+        break;
     case FieldType::Flag: json += entry->kind == ValueKind::True ? '1' : '0'; break;
     case FieldType::Digits:
     case FieldType::Label:
@@ -122,13 +141,21 @@ private:
 
     void addRow(std::string_view labels)
     {
-        constexpr double secondsOfWeek = 7 * 86400;
+        constexpr double secondsOfDay = 86400;
+        constexpr double secondsOfWeek = 7 * secondsOfDay;
         constexpr double beforeThursday = 3 * 86400; // 1970 began on one
         Row& row = batch_.rows.emplace_back();
         row.table = row_.kind().table;
-        row.week = static_cast<std::uint32_t>((row_.number(row_.kind().week) + beforeThursday) / secondsOfWeek);
+        const double moment = momentOf(row_);
+        row.week = static_cast<std::uint32_t>((moment + beforeThursday) / secondsOfWeek);
+        if (row_.number("seconds") > secondsOfDay)
+            row.week += weekOfLong;
         for (const Field& field : row_.kind().fields)
             appendColumn(field, row_, row.json);
+        if (const std::string_view column = row_.kind().microseconds; !column.empty()) {
+            fmt::format_to(std::back_inserter(row.json), ",\"{}\":", column);
+            appendWhole(foundation::wholeMicroseconds(moment), row.json);
+        }
         row.json += labels;
         row.json += "}\n";
         written_ += row.json.size();

@@ -22,9 +22,12 @@ constexpr std::size_t largestContent = 8 * 1024 * 1024;
 constexpr std::size_t largestRows = 32 * 1024 * 1024; // as they are written for the database
 constexpr std::size_t mostBadRows = 1000;
 
+// Is added to the week of a stretch of more than a day: such have partitions of their own.
+constexpr std::uint32_t weekOfLong = 1'000'000;
+
 struct Row {
     Table table;
-    std::uint32_t week; // from Monday on, as the partitions of the tables; 1970 begins in week 0
+    std::uint32_t week; // from Monday on, as the partitions of the tables; 1970 begins in week 0. See weekOfLong
     std::string json; // a line of JSONEachRow, with its end
 };
 

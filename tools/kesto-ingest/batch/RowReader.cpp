@@ -153,9 +153,10 @@ std::string_view lacking(const RowEntry& entry, FieldType type)
     case FieldType::Integer: return isInteger<std::int64_t>(entry) ? "" : "an integer of 64 bits";
     case FieldType::Count: return isInteger<std::uint32_t>(entry) ? "" : "an integer from 0 to 2^32 - 1";
     case FieldType::Moment:
+    case FieldType::Length:
         return isNumberBetween(entry, 0, latestMoment) ? "" : "a number of seconds from 0 to 2^32 - 1";
-    case FieldType::Number: return isNumberBetween(entry, -largest, largest) ? "" : "a number";
-    case FieldType::Length: return isNumberBetween(entry, 0, largest) ? "" : "a number from 0 on";
+    case FieldType::Number:
+    case FieldType::Share: return isNumberBetween(entry, -largest, largest) ? "" : "a number";
     case FieldType::Flag: return entry.kind == ValueKind::False || entry.kind == ValueKind::True ? "" : "true or false";
     case FieldType::Label: return isText && entry.text.size() <= longestLabel ? "" : "a text of at most 128 bytes";
     case FieldType::Text: return isText && entry.text.size() <= longestText ? "" : "a text of at most 16384 bytes";

@@ -42,13 +42,13 @@ constexpr Field stretchFields[] = {
     {"kind", FieldType::Text, required, ""},
     {"id", FieldType::Identity, required, "id"},
     {"recording", FieldType::Flag, required, "recording"},
-    {"began", FieldType::Moment, required, "began"},
-    {"seconds", FieldType::Length, required, "seconds"},
+    {"began", FieldType::Moment, required, ""},
+    {"seconds", FieldType::Length, required, "microseconds"},
     {"session", FieldType::Identity, optional, "session"},
     {"device_name", FieldType::Text, optional, "audio_device"},
     {"format", FieldType::Text, optional, "format"},
     {"channels", FieldType::Count, optional, "channels"},
-    {"volume", FieldType::Number, optional, "volume"},
+    {"volume", FieldType::Share, optional, "volume_millionths"},
     {"application", FieldType::Text, optional, "application"},
     {"ending", FieldType::Text, optional, "ending"},
 };
@@ -67,10 +67,10 @@ constexpr Field sessionFields[] = {
 };
 
 constexpr std::array<RowKind, tableCount> kinds = {
-    RowKind{"device", Table::Batches, "sent", deviceFields},
-    RowKind{"event", Table::Events, "time", eventFields},
-    RowKind{"stretch", Table::Stretches, "began", stretchFields},
-    RowKind{"session", Table::Sessions, "began", sessionFields},
+    RowKind{"device", Table::Batches, "sent", "", "", deviceFields},
+    RowKind{"event", Table::Events, "happened", "time", "happened_us", eventFields},
+    RowKind{"stretch", Table::Stretches, "began", "", "began_us", stretchFields},
+    RowKind{"session", Table::Sessions, "began", "", "", sessionFields},
 };
 
 } // namespace

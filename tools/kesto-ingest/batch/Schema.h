@@ -14,7 +14,8 @@ enum class FieldType : std::uint8_t {
     Identity, // an integer of 63 bits, not negative
     Moment, // seconds since 1970 UTC that a date of the database can express
     Number, // finite
-    Length, // a number that is not negative
+    Length, // seconds that a moment can have; a column of whole microseconds
+    Share, // a number; a column of whole millionths of 0 to 1
     Count, // an integer of 32 bits, not negative
     Integer, // of 64 bits
     Flag, // a boolean
@@ -36,7 +37,9 @@ struct Field {
 struct RowKind {
     std::string_view name;
     Table table;
-    std::string_view week; // the key of the moment whose week chooses the partition
+    std::string_view moment; // the key of the moment whose week chooses the partition
+    std::string_view otherMoment; // the key in its place, if that is not told or no date can express it
+    std::string_view microseconds; // the column that has this moment in whole microseconds; empty: none
     std::span<const Field> fields;
 };
 

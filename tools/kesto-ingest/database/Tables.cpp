@@ -23,7 +23,7 @@ struct Column {
 struct TableDefinition {
     std::string_view name;
     std::string_view meaning;
-    std::string_view week; // of which moment
+    std::string_view partition;
     std::string_view order;
     std::string_view winner; // the column that says which of several rows with one key stays; empty: any
     std::span<const Column> columns;
@@ -57,6 +57,7 @@ constexpr Column eventColumns[] = {
     device,
     epoch,
     id,
+    {fromRow, "happened_us", "Int64", "microseconds since 1970 UTC: when it happened, or else `time`"},
     {fromRow, "time", "Float64", "when it was sent, by the device's clock"},
     {fromRow, "happened", "Nullable(Float64)", "when it happened, if told"},
     {fromRow, "name", "String", ""},
@@ -75,15 +76,18 @@ constexpr Column stretchColumns[] = {
     epoch,
     id,
     {fromRow, "recording", "UInt8", "0: it played"},
-    {fromRow, "began", "Float64", ""},
-    {fromRow, "seconds", "Float64", ""},
+    {fromRow, "began_us", "Int64", "microseconds since 1970 UTC. Whole numbers add up to the same in any order"},
+    {fromRow, "microseconds", "Int64", "how long"},
+    {workedOut, "began", "Float64 DEFAULT began_us / 1000000", "in seconds, as the next two"},
+    {workedOut, "seconds", "Float64 DEFAULT microseconds / 1000000", ""},
     {workedOut, "played_seconds", "Float64 DEFAULT if(recording, 0, seconds)", ""},
     session,
     application,
     {fromRow, "audio_device", "String", "empty: not known, as in the next"},
     {fromRow, "format", "String", ""},
     {fromRow, "channels", "Nullable(UInt32)", ""},
-    {fromRow, "volume", "Nullable(Float64)", ""},
+    {fromRow, "volume_millionths", "Nullable(UInt32)", "0: muted, 1000000: all of the slider"},
+    {workedOut, "volume", "Nullable(Float64) DEFAULT volume_millionths / 1000000", "from 0 to 1"},
     {fromRow, "ending", "String", ""},
     model,
     release,
@@ -106,11 +110,14 @@ constexpr Column sessionColumns[] = {
     received,
 };
 
+// A stretch of more than a day is apart: who looks for those that began before a moment and went on reads one day before
+// it, and these few.
 constexpr TableDefinition tables[] = {
-    {"batches", "what each device has sent", "sent", "device, epoch, last_id, first_id", "", batchColumns},
-    {"events", "what messages told", "time", "device, epoch, id", "", eventColumns},
-    {"stretches", "who played or recorded for how long", "began", "device, epoch, id", "", stretchColumns},
-    {"sessions", "of the devices' clients", "began", "device, epoch, id", "has_ended", sessionColumns},
+    {"batches", "what each device has sent", "toMonday(toDateTime(toUInt32(sent)))", "device, epoch, last_id, first_id", "", batchColumns},
+    {"events", "what messages told", "toMonday(toDateTime(intDiv(happened_us, 1000000)))", "device, epoch, id", "", eventColumns},
+    {"stretches", "who played or recorded for how long",
+     "(toMonday(toDateTime(intDiv(began_us, 1000000))), microseconds > 86400000000)", "device, epoch, id", "", stretchColumns},
+    {"sessions", "of the devices' clients", "toMonday(toDateTime(toUInt32(began)))", "device, epoch, id", "has_ended", sessionColumns},
 };
 
 std::string columnsText(const TableDefinition& table)
@@ -139,8 +146,8 @@ std::string tableText(const TableDefinition& table, std::string_view database, s
     std::string text = fmt::format("-- {}\nCREATE TABLE IF NOT EXISTS {}.{}{}{} (\n{})", table.meaning, database,
                                    table.name, isPlain ? "" : "_local", onCluster, columnsText(table));
     text += fmt::format(
-        " ENGINE = {}ReplacingMergeTree({})\nPARTITION BY toMonday(toDateTime(toUInt32({})))\nORDER BY ({});\n\n",
-        isPlain ? "" : "Replicated", arguments, table.week, table.order);
+        " ENGINE = {}ReplacingMergeTree({})\nPARTITION BY {}\nORDER BY ({});\n\n",
+        isPlain ? "" : "Replicated", arguments, table.partition, table.order);
     if (!isPlain)
         text += fmt::format("CREATE TABLE IF NOT EXISTS {0}.{1}{2} AS {0}.{1}_local\n"
                             "ENGINE = Distributed({3}, {0}, {1}_local, cityHash64(device));\n\n",

@@ -3,6 +3,7 @@
 // does not notice, and of a large one the sessions lie beside each other.
 #include "kesto/history/History.h"
 
+#include "foundation/values/Microseconds.h"
 #include "foundation/values/String.h"
 #include "kesto/history/HistoryQueries.h"
 #include "kesto/store/EventDatabase.h"
@@ -28,6 +29,12 @@ constexpr std::string_view serviceEnded = "service-ended";
 double present()
 {
     return std::chrono::duration<double>(std::chrono::system_clock::now().time_since_epoch()).count();
+}
+
+// To six decimals.
+double rounded(double number)
+{
+    return std::nearbyint(number * foundation::millionthsOfOne) / foundation::millionthsOfOne;
 }
 
 std::optional<double> realAt(const SqliteStatement& row, int column)
@@ -95,8 +102,8 @@ private:
     void add(const SqliteStatement& row, double seconds, std::string_view ending)
     {
         history_.stretches.push_back({.session = row.integer(0),
-                                      .began = row.real(2),
-                                      .seconds = seconds,
+                                      .began = rounded(row.real(2)),
+                                      .seconds = rounded(seconds),
                                       .device = std::string(row.text(3)),
                                       .format = std::string(row.text(4)),
                                       .volume = realAt(row, 5),
@@ -104,7 +111,7 @@ private:
                                       .hasVanished = ending == "vanished",
                                       .hasServiceEnded = ending == serviceEnded});
         if (auto& volume = history_.stretches.back().volume)
-            volume = std::clamp(*volume, 0.0, 1.0);
+            volume = rounded(std::clamp(*volume, 0.0, 1.0));
     }
 
     void bindQuestion(const SqliteStatement& statement) const
@@ -153,7 +160,7 @@ private:
         database_.forEachRow(statement, [this](const SqliteStatement& row) {
             constexpr std::int64_t most = 1'000'000'000; // what a client says can still be added up
             history_.faults.push_back({.session = row.integer(0),
-                                       .happened = row.real(1),
+                                       .happened = rounded(row.real(1)),
                                        .kind = std::string(row.text(2).substr(history_queries::faultPrefix.size())),
                                        .device = std::string(foundation::cutBetweenCharacters(
                                            row.text(3), platform::PlayingFacts::longestDevices)), // as of a stretch

@@ -1,7 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // The room of the history: what was played and recorded, and where it went wrong, as the event store has it.
 //
-// It is read in one short transaction and then plain data: whoever draws or counts no longer holds the database.
+// It is read in one short transaction and then plain data: whoever draws or counts no longer holds the database. Times
+// are rounded to microseconds and volumes to millionths, as in the database of a fleet: so both tell the same.
 #pragma once
 
 #include <cstdint>

@@ -3,6 +3,7 @@
 // keeps a list of sessions.
 #include "kesto/report/Report.h"
 
+#include "foundation/values/Microseconds.h"
 #include "kesto/report/Calendar.h"
 
 #include <algorithm>
@@ -12,6 +13,9 @@
 #include <tuple>
 #include <unordered_map>
 #include <utility>
+
+using foundation::secondsOf;
+using foundation::wholeMicroseconds;
 
 std::optional<double> Played::meanVolume() const
 {
@@ -26,35 +30,49 @@ std::optional<double> Played::faultsAnHour() const
     return seconds > 0 ? std::optional(static_cast<double>(faults) * secondsAnHour / seconds) : std::nullopt;
 }
 
+Played PlayedSum::played() const
+{
+    return {.seconds = secondsOf(microseconds),
+            .mutedSeconds = secondsOf(muted),
+            .noVolumeSeconds = secondsOf(noVolume),
+            .volumeSeconds = secondsOf(volume),
+            .sessions = sessions,
+            .faults = faults};
+}
+
 namespace {
 
 using Index = std::size_t;
+using Microseconds = std::int64_t; // since 1970 UTC, or a length
+using Millionths = std::int64_t; // of the slider
 
 // The part of a stretch that lies in a span of time.
 struct Piece {
     std::int64_t session = 0;
-    double from = 0;
-    double until = 0;
-    std::optional<double> volume; // 0 to 1
+    Microseconds from = 0;
+    Microseconds until = 0;
+    std::optional<Millionths> volume;
+
+    [[nodiscard]] Microseconds length() const { return until - from; }
 };
 
 struct Sum {
-    Played played;
+    PlayedSum played{};
     std::optional<std::int64_t> lastSession;
 
     bool meets(std::int64_t session) { return std::exchange(lastSession, session) != session; }
 
     void add(const Piece& piece)
     {
-        const double seconds = piece.until - piece.from;
+        const Microseconds length = piece.length();
         played.sessions += meets(piece.session) ? 1 : 0;
-        played.seconds += seconds;
+        played.microseconds += length;
         if (!piece.volume)
-            played.noVolumeSeconds += seconds;
+            played.noVolume += length;
         else if (*piece.volume == 0)
-            played.mutedSeconds += seconds;
+            played.muted += length;
         else
-            played.volumeSeconds += seconds * *piece.volume;
+            played.volume += std::llrint(static_cast<double>(length) * secondsOf(*piece.volume));
     }
 };
 
@@ -79,8 +97,8 @@ public:
         for (Index line = 0; line < order.size(); ++line)
             order[line] = line;
         std::ranges::sort(order, [&](Index one, Index other) {
-            const Played& first = sums_[one].played;
-            const Played& second = sums_[other].played;
+            const PlayedSum& first = sums_[one].played;
+            const PlayedSum& second = sums_[other].played;
             if (isBefore(first, second) || isBefore(second, first))
                 return isBefore(first, second);
             return keys_[one] < keys_[other];
@@ -88,7 +106,7 @@ public:
         std::vector<Index> ranks(order.size());
         for (Index rank = 0; rank < order.size(); ++rank) {
             ranks[order[rank]] = rank;
-            finished_.push_back({.key = std::string(keys_[order[rank]]), .played = sums_[order[rank]].played});
+            finished_.push_back({.key = std::string(keys_[order[rank]]), .played = sums_[order[rank]].played.played()});
         }
         return ranks;
     }
@@ -101,12 +119,12 @@ private:
     std::vector<ReportLine> finished_;
 };
 
-bool hasMoreTime(const Played& one, const Played& other)
+bool hasMoreTime(const PlayedSum& one, const PlayedSum& other)
 {
-    return std::tie(one.seconds, one.faults) > std::tie(other.seconds, other.faults);
+    return std::tie(one.microseconds, one.faults) > std::tie(other.microseconds, other.faults);
 }
 
-bool hasMoreFaults(const Played& one, const Played& other)
+bool hasMoreFaults(const PlayedSum& one, const PlayedSum& other)
 {
     return one.faults > other.faults;
 }
@@ -130,6 +148,10 @@ public:
     {
         report_.isRecording = isRecording;
         report_.span = withEnds(span, history);
+        if (report_.span.from < report_.span.until) {
+            from_ = wholeMicroseconds(report_.span.from);
+            until_ = wholeMicroseconds(report_.span.until);
+        }
         for (const auto& [date, ofDay] : daysOf(report_.span, dayStart))
             report_.days.push_back({.date = date, .span = ofDay, .played = {}, .byApplication = {}, .byDevice = {}});
         days_.resize(report_.days.size());
@@ -141,8 +163,8 @@ public:
             if (const auto piece = pieceOf(stretch))
                 add(stretch, *piece);
         for (const Fault& fault : history_.faults)
-            if (fault.happened >= report_.span.from && fault.happened < report_.span.until)
-                add(fault);
+            if (std::isfinite(fault.happened) && momentOf(fault.happened) >= from_ && momentOf(fault.happened) < until_)
+                add(fault, momentOf(fault.happened));
         finishTables();
         finishDays();
         report_.isOverlapping = areOverlapping();
@@ -151,6 +173,8 @@ public:
     }
 
 private:
+    static constexpr double far = 4e12; // seconds
+
     // What counts, and in which lines.
     struct CountedPiece {
         Piece piece;
@@ -159,6 +183,7 @@ private:
     };
     struct CountedFault {
         const Fault* fault;
+        Microseconds moment;
         Index application;
         Index device;
     };
@@ -167,21 +192,29 @@ private:
         std::vector<Sum> devices;
     };
 
+    // What is far outside of every calendar is no further than this.
+    static Microseconds momentOf(double seconds) { return wholeMicroseconds(std::clamp(seconds, -far, far)); }
+    static Microseconds endOf(const PlayedStretch& stretch)
+    {
+        const bool isFar = std::abs(stretch.began) > far || std::abs(stretch.seconds) > far;
+        return isFar ? momentOf(stretch.began + stretch.seconds)
+                     : wholeMicroseconds(stretch.began) + wholeMicroseconds(stretch.seconds);
+    }
+
     // None of times that no clock shows.
     [[nodiscard]] std::optional<Piece> pieceOf(const PlayedStretch& stretch) const
     {
-        const double ends = stretch.began + stretch.seconds;
-        if (!std::isfinite(stretch.began) || !std::isfinite(ends))
+        if (!std::isfinite(stretch.began) || !std::isfinite(stretch.began + stretch.seconds))
             return std::nullopt;
         Piece piece{.session = stretch.session,
-                    .from = std::max(stretch.began, report_.span.from),
-                    .until = std::min(ends, report_.span.until),
+                    .from = std::max(momentOf(stretch.began), from_),
+                    .until = std::min(endOf(stretch), until_),
                     .volume = {}};
         const bool hasJustBegun = stretch.isRunning && piece.from == piece.until;
         if (!(piece.from < piece.until) && !hasJustBegun)
             return std::nullopt;
         if (stretch.volume && std::isfinite(*stretch.volume))
-            piece.volume = std::clamp(*stretch.volume, 0.0, 1.0);
+            piece.volume = foundation::wholeMillionths(std::clamp(*stretch.volume, 0.0, 1.0));
         return piece;
     }
 
@@ -201,23 +234,23 @@ private:
         report_.running += stretch.isRunning && running_.meets(stretch.session) ? 1 : 0;
         report_.vanished += hasVanished(stretch) && vanished_.meets(stretch.session) ? 1 : 0;
         if (piece.volume && *piece.volume > 0)
-            report_.secondsAtVolume[stepOf(*piece.volume)] += piece.until - piece.from;
+            atVolume_[stepOf(*piece.volume)] += piece.length();
         pieces_.push_back({piece, application, device});
     }
 
     // In the span.
     [[nodiscard]] bool hasVanished(const PlayedStretch& stretch) const
     {
-        return stretch.hasVanished && stretch.began + stretch.seconds <= report_.span.until;
+        return stretch.hasVanished && endOf(stretch) <= until_;
     }
 
-    static Index stepOf(double volume)
+    // Of one that is not muted.
+    static Index stepOf(Millionths volume)
     {
-        const double step = std::ceil(volume * Report::volumeSteps);
-        return static_cast<Index>(std::clamp(step, 1.0, double{Report::volumeSteps})) - 1;
+        return static_cast<Index>((volume * Millionths{Report::volumeSteps} - 1) / Millionths{1'000'000});
     }
 
-    void add(const Fault& fault)
+    void add(const Fault& fault, Microseconds moment)
     {
         const PlayedStretch* const stretch = stretchOf(history_, fault);
         const Index application = applications_.of(applicationOf(fault.session));
@@ -225,18 +258,19 @@ private:
         const Index format = formats_.of(stretch == nullptr ? std::string_view() : std::string_view(stretch->format));
         for (Sum* const sum : {&all_, &applications_[application], &devices_[device], &formats_[format]})
             ++sum->played.faults;
-        faults_.push_back({&fault, application, device});
+        faults_.push_back({&fault, moment, application, device});
     }
 
     void finishTables()
     {
         std::ranges::stable_sort(faults_, {}, [](const CountedFault& each) { return each.fault->session; });
-        for (const auto& [fault, application, device] : faults_) {
+        for (const auto& [fault, moment, application, device] : faults_) {
             Sum& kind = kinds_[kinds_.of(fault->kind)];
             ++kind.played.faults;
             kind.played.sessions += kind.meets(fault->session) ? 1 : 0;
         }
-        report_.all = all_.played;
+        report_.all = all_.played.played();
+        std::ranges::transform(atVolume_, report_.secondsAtVolume.begin(), secondsOf);
         applicationRanks_ = applications_.sort(hasMoreTime);
         deviceRanks_ = devices_.sort(hasMoreTime);
         formats_.sort(hasMoreTime);
@@ -250,10 +284,10 @@ private:
     // --- Days
 
     // Of a moment in the span.
-    [[nodiscard]] Index dayAt(double moment) const
+    [[nodiscard]] Index dayAt(Microseconds moment) const
     {
-        const auto next =
-            std::ranges::upper_bound(report_.days, moment, {}, [](const ReportDay& day) { return day.span.from; });
+        const auto next = std::ranges::upper_bound(
+            report_.days, moment, {}, [](const ReportDay& day) { return wholeMicroseconds(day.span.from); });
         return static_cast<Index>(std::max<std::ptrdiff_t>(next - report_.days.begin(), 1) - 1);
     }
 
@@ -266,16 +300,16 @@ private:
         }
         for (const CountedPiece& each : pieces_)
             addToDays(each);
-        for (const auto& [fault, application, device] : faults_) {
-            DaySums& sums = days_[dayAt(fault->happened)];
+        for (const auto& [fault, moment, application, device] : faults_) {
+            DaySums& sums = days_[dayAt(moment)];
             ++sums.all.played.faults;
             if (const Index rank = deviceRanks_[device]; rank < sums.devices.size())
                 ++sums.devices[rank].played.faults;
         }
         for (Index day = 0; day < days_.size(); ++day) {
-            report_.days[day].played = days_[day].all.played;
+            report_.days[day].played = days_[day].all.played.played();
             for (const Sum& device : days_[day].devices)
-                report_.days[day].byDevice.push_back(device.played);
+                report_.days[day].byDevice.push_back(device.played.played());
         }
     }
 
@@ -283,16 +317,16 @@ private:
     {
         const auto& [piece, application, device] = counted;
         for (Index day = dayAt(piece.from); day < days_.size(); ++day) {
-            const TimeSpan& span = report_.days[day].span;
+            const Microseconds ends = wholeMicroseconds(report_.days[day].span.until);
             Piece part = piece;
-            part.from = std::max(piece.from, span.from);
-            part.until = std::min(piece.until, span.until);
+            part.from = std::max(piece.from, wholeMicroseconds(report_.days[day].span.from));
+            part.until = std::min(piece.until, ends);
             days_[day].all.add(part);
             if (const Index rank = applicationRanks_[application]; rank < Report::mostInDays)
-                report_.days[day].byApplication[rank] += part.until - part.from;
+                report_.days[day].byApplication[rank] += secondsOf(part.length());
             if (const Index rank = deviceRanks_[device]; rank < Report::mostInDays)
                 days_[day].devices[rank].add(part);
-            if (piece.until <= span.until)
+            if (piece.until <= ends)
                 return;
         }
     }
@@ -301,13 +335,13 @@ private:
 
     [[nodiscard]] bool areOverlapping() const
     {
-        constexpr double rounding = 0.001; // of stretches that follow one another
-        std::vector<std::pair<double, double>> times;
+        constexpr Microseconds rounding = 1000; // of stretches that follow one another
+        std::vector<std::pair<Microseconds, Microseconds>> times;
         times.reserve(pieces_.size());
         for (const CountedPiece& each : pieces_)
             times.emplace_back(each.piece.from, each.piece.until);
         std::ranges::sort(times);
-        double latest = -std::numeric_limits<double>::infinity();
+        Microseconds latest = from_;
         for (const auto& [from, until] : times) {
             if (std::min(latest, until) - from > rounding)
                 return true;
@@ -325,7 +359,7 @@ private:
             std::int64_t session = 0;
         };
         std::vector<OfSession> sessions;
-        for (const auto& [fault, application, device] : faults_) {
+        for (const auto& [fault, moment, application, device] : faults_) {
             if (fault->session == 0)
                 continue;
             if (sessions.empty() || sessions.back().session != fault->session)
@@ -359,14 +393,14 @@ private:
         worst.session.id = id;
         worst.lateCycles = lateCycles;
         Sum sum;
-        std::map<std::string_view, double> devices;
+        std::map<std::string_view, Microseconds> devices;
         for (const PlayedStretch& stretch :
              std::ranges::equal_range(history_.stretches, id, {}, &PlayedStretch::session)) {
             const auto piece = pieceOf(stretch);
             if (!piece)
                 continue;
             sum.add(*piece);
-            devices[stretch.device] += piece->until - piece->from;
+            devices[stretch.device] += piece->length();
             worst.stretches.push_back(stretch);
             worst.isRunning |= stretch.isRunning;
             worst.hasVanished |= hasVanished(stretch);
@@ -374,18 +408,18 @@ private:
         for (const CountedFault& each :
              std::ranges::equal_range(faults_, id, {}, [](const CountedFault& each) { return each.fault->session; }))
             worst.faults.push_back(*each.fault);
-        worst.played = sum.played;
+        worst.played = sum.played.played();
         worst.played.faults = worst.faults.size();
         worst.devices = longestFirst(devices);
         return worst;
     }
 
-    static std::string longestFirst(const std::map<std::string_view, double>& devices)
+    static std::string longestFirst(const std::map<std::string_view, Microseconds>& devices)
     {
-        std::vector<std::pair<std::string_view, double>> sorted(devices.begin(), devices.end());
-        std::ranges::stable_sort(sorted, std::greater(), &std::pair<std::string_view, double>::second);
+        std::vector<std::pair<std::string_view, Microseconds>> sorted(devices.begin(), devices.end());
+        std::ranges::stable_sort(sorted, std::greater(), &std::pair<std::string_view, Microseconds>::second);
         std::string text;
-        for (const auto& [device, seconds] : sorted)
+        for (const auto& [device, time] : sorted)
             if (!device.empty())
                 text.append(text.empty() ? "" : "; ").append(device);
         return text;
@@ -393,6 +427,9 @@ private:
 
     const History& history_;
     Report report_;
+    Microseconds from_ = 0; // of the span
+    Microseconds until_ = 0;
+    std::array<Microseconds, Report::volumeSteps> atVolume_{};
     Sum all_;
     Sum running_; // of these two only whether they met a session
     Sum vanished_;

@@ -29,10 +29,38 @@ struct Played {
     [[nodiscard]] std::optional<double> faultsAnHour() const;
 };
 
-// A line of a table: its key is an application, a device, a format or a kind of fault. Empty: not told.
+// The same in whole numbers, whose sums are the same in any order: the database of a fleet adds in another one. Shares of
+// the volume are rounded for each part of a stretch that counts on its own.
+struct PlayedSum {
+    std::int64_t microseconds = 0;
+    std::int64_t muted = 0;
+    std::int64_t noVolume = 0;
+    std::int64_t volume = 0;
+    std::size_t sessions = 0;
+    std::size_t faults = 0;
+
+    [[nodiscard]] Played played() const;
+};
+
+// Of a figure of each unit, which is a device of a fleet. A device is what sound comes out of.
+struct Distribution {
+    double median = 0;
+    double ninetieth = 0; // so much or less at 90 % of the units
+    double most = 0;
+};
+
+struct OverUnits {
+    std::size_t units = 0; // that played
+    std::size_t compared = 0; // those of them that played long enough for the next
+    std::optional<Distribution> faultsAnHour = {};
+};
+
+// A line of a table: its key is an application, a device, a format or a kind of fault; of a fleet also a model, a
+// release or a unit. Empty: not told.
 struct ReportLine {
     std::string key;
     Played played;
+    std::optional<OverUnits> overUnits = {}; // of a fleet, if it was asked for
 };
 
 // A day of the reader: from one moment of the clock on the wall to the same of the next day, 23 or 25 hours where
@@ -49,12 +77,32 @@ struct ReportDay {
 struct WorstSession {
     HistorySession session;
     Played played;
+    std::string unit = {}; // of a fleet: its pseudonym
     std::int64_t lateCycles = 0;
     std::string devices; // all it played on, "speaker; headset", the longest first
     std::vector<PlayedStretch> stretches; // by time
     std::vector<Fault> faults; // by time
     bool isRunning = false;
     bool hasVanished = false;
+};
+
+struct WorstUnit {
+    std::string unit; // its pseudonym
+    std::string model;
+    std::string version;
+    Played played;
+};
+
+// What only the report of a fleet has.
+struct FleetPart {
+    static constexpr double leastHours = 1; // units that played less are not compared by their faults an hour
+
+    OverUnits overUnits = {};
+    std::optional<Distribution> hours = {};
+    std::vector<ReportLine> models = {}; // those with the most time first, as in the next two
+    std::vector<ReportLine> versions = {};
+    std::vector<ReportLine> units = {};
+    std::vector<WorstUnit> worst = {}; // by faults an hour
 };
 
 struct Report {
@@ -77,6 +125,7 @@ struct Report {
     std::vector<ReportLine> faultKinds; // `played.faults` and `played.sessions` only; the most frequent first
     std::array<double, volumeSteps> secondsAtVolume{}; // not muted: [0] is up to 1/16
     std::vector<WorstSession> worst; // by missed cycles, then by faults
+    std::optional<FleetPart> fleet = {}; // then `running`, `isOverlapping` and what days have by device are not known
 };
 
 // Where days begin.

@@ -9,6 +9,7 @@
 #include "kesto/report/ReportCsv.h"
 #include "kesto/report/ReportJson.h"
 #include "kesto/report/ReportText.h"
+#include "kesto/report/fleet/FleetReport.h"
 #include "kesto/report/page/ReportPage.h"
 #include "kesto/results/MomentText.h"
 
@@ -43,6 +44,11 @@ struct ReportOptions {
     bool isCsv = false;
     bool isJson = false;
     std::optional<std::string> page; // the path of the file; "-": standard output
+    FleetAddress fleet; // without servers: the report of this device
+    std::string unit;
+    unsigned timeLimit = 30; // seconds
+
+    [[nodiscard]] bool isOfFleet() const { return !fleet.database.servers.empty(); }
 };
 
 // The last day of the report and the six before it are a week.
@@ -89,6 +95,33 @@ void useUTC()
     ::tzset();
 }
 
+constexpr std::array allTables{ReportBy::Day,    ReportBy::Application, ReportBy::Device,
+                               ReportBy::Volume, ReportBy::Format,      ReportBy::Fault,
+                               ReportBy::Model,  ReportBy::Version,     ReportBy::Unit};
+
+// None if `--by` is not there.
+std::optional<ReportBy> chosenTable(const ReportOptions& options)
+{
+    const auto* const chosen =
+        std::ranges::find_if(allTables, [&options](ReportBy by) { return name(by) == options.by; });
+    return chosen == allTables.end() ? std::nullopt : std::optional(*chosen);
+}
+
+// What the chosen output shows.
+FleetParts partsOf(const ReportOptions& options)
+{
+    if (options.isJson || options.page)
+        return {.tables = {allTables.begin(), allTables.end() - 1},
+                .withOverUnits = true,
+                .withWorst = true,
+                .withDaysOfLines = options.page.has_value()};
+    if (const auto chosen = chosenTable(options))
+        return {.tables = {*chosen}, .withOverUnits = options.isCsv || *chosen != ReportBy::Day};
+    if (options.isCsv)
+        return {.tables = {ReportBy::Day}, .withOverUnits = true};
+    return {.tables = {ReportBy::Day, ReportBy::Application}};
+}
+
 Report reportOf(ReportOptions& options)
 {
     DayStart dayStart{.afterMidnight = {}, .isUTC = options.isUTC};
@@ -102,24 +135,29 @@ Report reportOf(ReportOptions& options)
     span.from = options.since ? momentOf("--since", *options.since) : beginningOf(last - daysBefore, dayStart);
     if (std::max(span.from, calendarSpan.from) >= ends)
         throw CLI::ValidationError(options.since ? "--since" : "--until", "the report would end before it begins");
-    const History history = readHistory(options.database, options.question);
+    if (options.isOfFleet()) {
+        span = {.from = std::max(span.from, calendarSpan.from), .until = ends};
+        options.fleet.database.timeLimit = std::chrono::seconds(options.timeLimit);
+        return makeFleetReport(options.fleet, {.history = options.question, .unit = options.unit}, dayStart,
+                               partsOf(options));
+    }
+    HistoryQuestion question = options.question;
+    constexpr double rounding = 1e-5; // the report cuts at whole microseconds
+    question.span = {.from = span.from - rounding, .until = span.until + rounding};
+    const History history = readHistory(options.database, question);
     span.until = std::min(span.until, present()); // what runs counts up to now
     return makeReport(history, span, options.question.isRecording, dayStart);
 }
 
-constexpr std::array allTables{ReportBy::Day,    ReportBy::Application, ReportBy::Device,
-                               ReportBy::Volume, ReportBy::Format,      ReportBy::Fault};
-
 std::string textOf(const Report& report, const ReportOptions& options)
 {
-    const auto chosen = std::ranges::find_if(allTables, [&options](ReportBy by) { return name(by) == options.by; });
-    const bool isChosen = chosen != allTables.end();
+    const auto chosen = chosenTable(options);
     if (options.isJson)
         return reportJson(report);
     if (options.isCsv)
-        return reportCsv(report, isChosen ? *chosen : ReportBy::Day);
+        return reportCsv(report, chosen.value_or(ReportBy::Day));
     const std::vector<ReportBy> tables =
-        isChosen ? std::vector{*chosen} : std::vector{ReportBy::Day, ReportBy::Application};
+        chosen ? std::vector{*chosen} : std::vector{ReportBy::Day, ReportBy::Application};
     return reportText(report, tables, {.width = outputWidth(), .isUTF8 = showsUTF8()});
 }
 
@@ -151,8 +189,8 @@ void writePage(const Report& report, const ReportOptions& options)
 {
     const std::string page =
         reportPage(report,
-                   {.host = hostName(),
-                    .database = options.database,
+                   {.host = options.isOfFleet() ? "fleet " + options.fleet.database.database : hostName(),
+                    .database = options.isOfFleet() ? options.fleet.database.servers.front() : options.database.string(),
                     .made = present(),
                     .timeZone = timeZoneName(options.isUTC)
                         + (options.dayStarts ? ", each from " + *options.dayStarts : std::string()),
@@ -172,6 +210,52 @@ std::vector<std::string> tableNames()
     return names;
 }
 
+CLI::Validator isAddress()
+{
+    return CLI::Validator(
+        [](const std::string& text) {
+            return text.starts_with("http://") || text.starts_with("https://")
+                ? std::string()
+                : "\"" + text + "\" is not an address such as http://127.0.0.1:8123";
+        },
+        "");
+}
+
+CLI::Validator isPseudonym()
+{
+    return CLI::Validator(
+        [](const std::string& text) {
+            return text.size() == 32 && text.find_first_not_of("0123456789abcdef") == std::string::npos
+                ? std::string()
+                : "\"" + text + "\" is not 32 hexadecimal digits, as kesto uplink status shows them";
+        },
+        "");
+}
+
+void addFleetOptions(CLI::App& command, ReportOptions& options)
+{
+    constexpr unsigned longestTime = 600;
+    fleet_database::ClickHouseConfiguration& database = options.fleet.database;
+    CLI::Option* fleet =
+        command
+            .add_option("--fleet", database.servers,
+                        "All devices of a fleet, from its database: http://HOST:8123, or several with commas between")
+            ->delimiter(',')
+            ->expected(1)
+            ->check(isAddress())
+            ->excludes("--database");
+    const auto add = [&](const char* option, auto& value, const char* description) {
+        return command.add_option(option, value, description)->needs(fleet);
+    };
+    add("--unit", options.unit, "Only the device of the fleet with this pseudonym")->check(isPseudonym());
+    add("--fleet-database", database.database, "The name of the fleet's database, in place of kesto");
+    add("--credentials", options.fleet.credentials, "A file with user and password of the fleet's database");
+    add("--certificate-authority", database.certificateAuthority,
+        "A PEM file for https://, in place of the authorities of the system");
+    add("--time-limit", options.timeLimit, "Seconds for each question to the fleet's database, in place of 30")
+        ->check(CLI::Range(1U, longestTime));
+}
+
 } // namespace
 
 void addReportCommand(CLI::App& application, int& exitStatus)
@@ -184,7 +268,10 @@ void addReportCommand(CLI::App& application, int& exitStatus)
                         "From then on, in place of seven days: 90s, 10m, 2h, 30d ago, or a time such as 2026-01-31");
     command->add_option("--until", options->until, "Until then, in place of now: as for --since");
     CLI::Option* by =
-        command->add_option("--by", options->by, "One table: by day, application, device, volume, format or fault")
+        command
+            ->add_option("--by", options->by,
+                         "One table: by day, application, device, volume, format or fault; with --fleet also by model, "
+                         "version or unit, which is a device of the fleet")
             ->check(CLI::IsMember(tableNames()).description(""));
     command->add_option("--application", options->question.applications,
                         "Only applications with matching names, such as 'org.example.*'");
@@ -201,7 +288,10 @@ void addReportCommand(CLI::App& application, int& exitStatus)
         ->excludes(by)
         ->excludes(csv)
         ->excludes(json);
+    addFleetOptions(*command, *options);
     command->callback([options, &exitStatus] {
+        if (const auto chosen = chosenTable(*options); !options->isOfFleet() && chosen && *chosen >= ReportBy::Model)
+            throw CLI::ValidationError("--by", options->by + " is known of a fleet only: name its database by --fleet");
         if (options->database.empty())
             options->database = usualDatabase();
         if (options->isUTC)

@@ -39,6 +39,20 @@ std::string figures(const Played& played)
                        volume ? decimalText(*volume, decimals) : std::string());
 }
 
+constexpr std::string_view unitColumns = ",units,median_faults_an_hour,ninetieth_faults_an_hour,most_faults_an_hour";
+
+// In these columns, with the comma before them.
+std::string overUnits(const std::optional<OverUnits>& of)
+{
+    constexpr int decimals = 4;
+    std::string text = fmt::format(",{}", of ? of->units : 0);
+    if (!of || !of->faultsAnHour)
+        return text + ",,,";
+    for (const double rate : {of->faultsAnHour->median, of->faultsAnHour->ninetieth, of->faultsAnHour->most})
+        text += ',' + decimalText(rate, decimals);
+    return text;
+}
+
 class Table {
 public:
     explicit Table(std::string head) : text_(std::move(head)) { text_ += '\n'; }
@@ -66,8 +80,8 @@ std::string volumes(const Report& report)
 std::string faults(const Report& report)
 {
     Table table("fault,faults,sessions");
-    for (const auto& [kind, played] : report.faultKinds)
-        table.add(kind, fmt::format("{},{}", played.faults, played.sessions));
+    for (const ReportLine& line : report.faultKinds)
+        table.add(line.key, fmt::format("{},{}", line.played.faults, line.played.sessions));
     return table.take();
 }
 
@@ -79,13 +93,14 @@ std::string reportCsv(const Report& report, ReportBy by)
         return volumes(report);
     if (by == ReportBy::Fault)
         return faults(report);
-    Table table(fmt::format("{},seconds,sessions,faults,mean_volume", name(by)));
+    const bool isOverUnits = report.fleet && by != ReportBy::Day && by != ReportBy::Unit;
+    Table table(fmt::format("{},seconds,sessions,faults,mean_volume{}", name(by), isOverUnits ? unitColumns : ""));
     if (by == ReportBy::Day) {
         for (const ReportDay& day : report.days)
             table.add(dateText(day.date), figures(day.played));
         return table.take();
     }
-    for (const auto& [key, played] : linesOf(report, by))
-        table.add(key, figures(played));
+    for (const ReportLine& line : linesOf(report, by))
+        table.add(line.key, figures(line.played) + (isOverUnits ? overUnits(line.overUnits) : std::string()));
     return table.take();
 }

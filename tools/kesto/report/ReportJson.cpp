@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Names stand as the clients sent them: JSON can express each character.
+// Names stand as the clients sent them: JSON can express each character. The report of a fleet has no key for what a
+// fleet does not know.
 #include "kesto/report/ReportJson.h"
 
 #include "foundation/values/Json.h"
@@ -24,10 +25,15 @@ Dictionary::Entries figures(const Played& played)
             {"faults_an_hour", valueOf(played.faultsAnHour())}};
 }
 
+void append(Dictionary::Entries& entries, Dictionary::Entries more)
+{
+    for (auto& entry : more)
+        entries.push_back(std::move(entry));
+}
+
 Dictionary withFigures(Dictionary::Entries entries, const Played& played)
 {
-    for (auto& entry : figures(played))
-        entries.push_back(std::move(entry));
+    append(entries, figures(played));
     return Dictionary(std::move(entries));
 }
 
@@ -40,59 +46,93 @@ template <typename Rows, typename Make> Array listOf(const Rows& rows, Make make
     return Array(std::move(list));
 }
 
+Value distribution(const std::optional<Distribution>& of)
+{
+    return of ? Value(Dictionary{{"median", of->median}, {"ninetieth", of->ninetieth}, {"most", of->most}}) : Value();
+}
+
+Dictionary::Entries overUnits(const OverUnits& of)
+{
+    return {{"units", of.units},
+            {"units_compared", of.compared},
+            {"faults_an_hour_of_units", distribution(of.faultsAnHour)}};
+}
+
 Array lines(const Report& report, ReportBy by)
 {
     return listOf(linesOf(report, by), [by](const ReportLine& line) {
         if (by == ReportBy::Fault)
             return Dictionary{{name(by), line.key}, {"faults", line.played.faults}, {"sessions", line.played.sessions}};
-        return withFigures({{name(by), line.key}}, line.played);
+        Dictionary::Entries entries{{name(by), line.key}};
+        if (line.overUnits)
+            append(entries, overUnits(*line.overUnits));
+        return withFigures(std::move(entries), line.played);
     });
 }
 
 Dictionary worst(const WorstSession& each)
 {
     const HistorySession& session = each.session;
-    return withFigures({{"session", session.id},
-                        {"application", session.application},
-                        {"service", session.service},
-                        {"process", session.process},
-                        {"process_id", valueOf(session.processID)},
-                        {"user", valueOf(session.user)},
-                        {"devices", each.devices},
-                        {"late_cycles", each.lateCycles},
-                        {"running", each.isRunning},
-                        {"vanished", each.hasVanished}},
-                       each.played);
+    Dictionary::Entries entries{{"session", session.id},
+                                {"application", session.application},
+                                {"service", session.service},
+                                {"process", session.process}};
+    const bool isOfFleet = !each.unit.empty();
+    if (isOfFleet)
+        append(entries, {{"unit", each.unit}});
+    else
+        append(entries, {{"process_id", valueOf(session.processID)}, {"user", valueOf(session.user)}});
+    append(entries, {{"devices", each.devices}, {"late_cycles", each.lateCycles}});
+    if (!isOfFleet)
+        append(entries, {{"running", each.isRunning}});
+    append(entries, {{"vanished", each.hasVanished}});
+    return withFigures(std::move(entries), each.played);
+}
+
+// What a fleet adds, or a device knows alone.
+Dictionary::Entries ownPart(const Report& report)
+{
+    if (!report.fleet)
+        return {{"running", report.running}, {"overlapping", report.isOverlapping}};
+    const FleetPart& fleet = *report.fleet;
+    Dictionary::Entries entries = overUnits(fleet.overUnits);
+    append(entries,
+           {{"hours_of_units", distribution(fleet.hours)},
+            {"models", lines(report, ReportBy::Model)},
+            {"versions", lines(report, ReportBy::Version)},
+            {"worst_units", listOf(fleet.worst, [](const WorstUnit& each) {
+                 return withFigures({{"unit", each.unit}, {"model", each.model}, {"version", each.version}},
+                                    each.played);
+             })}});
+    return entries;
 }
 
 } // namespace
 
 std::string reportJson(const Report& report)
 {
-    const Dictionary all = withFigures(
-        {{"from", report.span.from},
-         {"until", report.span.until},
-         {"recording", report.isRecording},
-         {"running", report.running},
-         {"vanished", report.vanished},
-         {"sessions_with_faults", report.withFaults},
-         {"overlapping", report.isOverlapping},
-         {"days",
-          listOf(report.days,
-                 [](const ReportDay& day) {
-                     return withFigures(
-                         {{"day", dateText(day.date)}, {"from", day.span.from}, {"until", day.span.until}}, day.played);
-                 })},
-         {"applications", lines(report, ReportBy::Application)},
-         {"devices", lines(report, ReportBy::Device)},
-         {"formats", lines(report, ReportBy::Format)},
-         {"fault_kinds", lines(report, ReportBy::Fault)},
-         {"volumes",
-          listOf(volumeSteps(report),
-                 [](const VolumeStep& step) { return Dictionary{{"volume", step.upTo}, {"seconds", step.seconds}}; })},
-         {"worst_sessions", listOf(report.worst, worst)}},
-        report.all);
+    Dictionary::Entries entries{
+        {"from", report.span.from},
+        {"until", report.span.until},
+        {"recording", report.isRecording},
+        {"vanished", report.vanished},
+        {"sessions_with_faults", report.withFaults},
+        {"days",
+         listOf(report.days,
+                [](const ReportDay& day) {
+                    return withFigures({{"day", dateText(day.date)}, {"from", day.span.from}, {"until", day.span.until}},
+                                       day.played);
+                })},
+        {"applications", lines(report, ReportBy::Application)},
+        {"devices", lines(report, ReportBy::Device)},
+        {"formats", lines(report, ReportBy::Format)},
+        {"fault_kinds", lines(report, ReportBy::Fault)},
+        {"volumes",
+         listOf(volumeSteps(report),
+                [](const VolumeStep& step) { return Dictionary{{"volume", step.upTo}, {"seconds", step.seconds}}; })},
+        {"worst_sessions", listOf(report.worst, worst)}};
+    append(entries, ownPart(report));
     std::string text;
-    foundation::appendJsonText(all, text);
+    foundation::appendJsonText(withFigures(std::move(entries), report.all), text);
     return text + '\n';
 }

@@ -7,7 +7,8 @@
 
 std::string_view name(ReportBy by)
 {
-    constexpr std::array<std::string_view, 6> names{"day", "application", "device", "volume", "format", "fault"};
+    constexpr std::array<std::string_view, 9> names{"day",   "application", "device",  "volume", "format",
+                                                    "fault", "model",       "version", "unit"};
     return names[static_cast<std::size_t>(by)];
 }
 
@@ -17,6 +18,9 @@ const std::vector<ReportLine>& linesOf(const Report& report, ReportBy by)
     case ReportBy::Device: return report.devices;
     case ReportBy::Format: return report.formats;
     case ReportBy::Fault: return report.faultKinds;
+    case ReportBy::Model: return report.fleet.value().models;
+    case ReportBy::Version: return report.fleet.value().versions;
+    case ReportBy::Unit: return report.fleet.value().units;
     default: return report.applications;
     }
 }

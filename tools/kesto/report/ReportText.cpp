@@ -133,7 +133,7 @@ public:
     {
         if (report_.all.sessions == 0 && report_.all.faults == 0)
             return nothing();
-        std::string text = summary() + '\n';
+        std::string text = summary() + '\n' + (report_.fleet ? distributions() : "");
         for (const ReportBy by : tables)
             text += table(by, tables.size() == 1);
         return text + notes();
@@ -144,6 +144,12 @@ private:
 
     [[nodiscard]] std::string nothing() const
     {
+        if (report_.fleet)
+            return fmt::format("Nothing that matches was {} between {} and {} on any unit whose reports have come.\n"
+                               "Look further back with --since 30d. If that is empty too: see kesto uplink status on a "
+                               "device.\n",
+                               done(), foundation::localTimeText(report_.span.from, "{:%Y-%m-%d %H:%M}"),
+                               foundation::localTimeText(report_.span.until, "{:%Y-%m-%d %H:%M}"));
         return fmt::format(
             "Nothing that matches was {} between {} and {}.\n"
             "Look further back with --since 30d. If that is empty too: nothing may report to kestod (see "
@@ -207,25 +213,56 @@ private:
     {
         std::string head(name(by));
         std::ranges::transform(head, head.begin(), [](char letter) { return static_cast<char>(letter - 'a' + 'A'); });
-        Table table(head, {{"PLAYED", 7}, {"SHARE", 5}, {"VOLUME", 6}, {"FAULTS", 6}, {"/HOUR", 5}});
+        std::vector<Table::Column> columns{{"PLAYED", 7}, {"SHARE", 5}, {"VOLUME", 6}, {"FAULTS", 6}, {"/HOUR", 5}};
         const auto& all = linesOf(report_, by);
+        const bool isOverUnits = isAlone && report_.fleet && by != ReportBy::Unit;
+        if (isOverUnits)
+            columns.insert(columns.end(), {{"UNITS", 5}, {"MEDIAN", 6}, {"90 %", 5}, {"WORST", 5}});
+        Table table(head, std::move(columns));
         const std::size_t shown = isAlone ? all.size() : std::min(all.size(), mostLines);
         double rest = 0;
         for (std::size_t index = 0; index < all.size(); ++index) {
-            const auto& [key, played] = all[index];
+            const Played& played = all[index].played;
             const auto volume = played.meanVolume();
-            if (index < shown)
-                table.add({keyText(key),
-                           {durationText(played.seconds), shareText(played.seconds), volume ? percentText(*volume) : "",
-                            fmt::format("{}", played.faults), rateText(played)},
-                           played.seconds});
-            else
+            if (index >= shown) {
                 rest += played.seconds;
+                continue;
+            }
+            std::vector<std::string> figures{durationText(played.seconds), shareText(played.seconds),
+                                             volume ? percentText(*volume) : "", fmt::format("{}", played.faults),
+                                             rateText(played)};
+            if (isOverUnits)
+                addOverUnits(all[index].overUnits.value_or(OverUnits()), figures);
+            table.add({keyText(all[index].key), std::move(figures), played.seconds});
         }
         std::string text = table.text(layout_);
         if (shown < all.size())
             text += fmt::format("and {} more with {}: --by {} shows all\n", all.size() - shown, durationText(rest),
                                 name(by));
+        return text;
+    }
+
+    static void addOverUnits(const OverUnits& of, std::vector<std::string>& figures)
+    {
+        figures.push_back(fmt::format("{}", of.units));
+        const Distribution rates = of.faultsAnHour.value_or(Distribution());
+        for (const double rate : {rates.median, rates.ninetieth, rates.most})
+            figures.push_back(of.faultsAnHour ? fmt::format("{:.2f}", rate) : "");
+    }
+
+    // Of a fleet.
+    [[nodiscard]] std::string distributions() const
+    {
+        const FleetPart& fleet = *report_.fleet;
+        if (!fleet.hours)
+            return "";
+        std::string text = fmt::format("{}; a unit {}: median {:.1f} h, 90 % up to {:.1f} h, most {:.1f} h\n",
+                                       countText(fleet.overUnits.units, "unit"), done(), fleet.hours->median,
+                                       fleet.hours->ninetieth, fleet.hours->most);
+        if (const auto& rates = fleet.overUnits.faultsAnHour)
+            text += fmt::format("faults an hour of a unit: median {:.2f}, 90 % up to {:.2f}, worst {:.2f}; of {} that "
+                                "{} an hour or more\n",
+                                rates->median, rates->ninetieth, rates->most, fleet.overUnits.compared, done());
         return text;
     }
 
@@ -247,10 +284,10 @@ private:
     [[nodiscard]] std::string faults() const
     {
         Table table("FAULT", {{"FAULTS", 7}, {"SESSIONS", 8}});
-        for (const auto& [kind, played] : report_.faultKinds)
-            table.add({keyText(kind),
-                       {fmt::format("{}", played.faults), fmt::format("{}", played.sessions)},
-                       static_cast<double>(played.faults)});
+        for (const ReportLine& line : report_.faultKinds)
+            table.add({keyText(line.key),
+                       {fmt::format("{}", line.played.faults), fmt::format("{}", line.played.sessions)},
+                       static_cast<double>(line.played.faults)});
         return table.text(layout_);
     }
 

@@ -66,13 +66,14 @@ TEST(Batch, BecomesRowsWithTheColumnsOfTheirTables)
     EXPECT_EQ(batch.rows[1].json,
               R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":3,)"
               R"("time":1795264505.66,"name":"com.quarn.kesto.Error.IssueDetector","payload":"{\"late_cycles\":3}",)"
-              R"("session":7,"application":"player","model":"lamp","version":"1.2"})"
+              R"("session":7,"application":"player","happened_us":1795264505660000,"model":"lamp","version":"1.2"})"
               "\n");
     EXPECT_EQ(batch.rows[2].table, Table::Stretches);
     EXPECT_EQ(batch.rows[2].json,
               R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":4,)"
-              R"("recording":0,"began":1795264500.25,"seconds":12.5,"session":7,"audio_device":"headset","channels":2,)"
-              R"("volume":0.5,"application":"player","ending":"stopped","model":"lamp","version":"1.2"})"
+              R"("recording":0,"microseconds":12500000,"session":7,"audio_device":"headset","channels":2,)"
+              R"("volume_millionths":500000,"application":"player","ending":"stopped","began_us":1795264500250000,)"
+              R"("model":"lamp","version":"1.2"})"
               "\n");
     EXPECT_EQ(batch.rows[3].table, Table::Sessions);
     EXPECT_EQ(batch.rows[3].json,
@@ -81,6 +82,44 @@ TEST(Batch, BecomesRowsWithTheColumnsOfTheirTables)
               R"("version":"1.2"})"
               "\n");
     EXPECT_EQ(batch.rows[1].week, 2968U); // 1795264505 s and three days are 2968.8 weeks
+}
+
+TEST(Batch, RoundsMomentsToMicrosecondsAndVolumesToMillionths)
+{
+    const auto stretchWith = [](std::string_view now) {
+        std::string line = stretchLine(4);
+        const std::string_view before = R"("began":1795264500.25,"seconds":12.5)";
+        line.replace(line.find(before), before.size(), now);
+        return line;
+    };
+    const Batch batch = batchOf(deviceLine(1, 9) + stretchWith(R"("began":1795264505.6600001,"seconds":0.0000015)")
+                                + stretchWith(R"("began":0,"seconds":4294967295)")
+                                + eventWith(R"("happened":1795264500.1234567,"id":5,)", R"("id":5,)") + "\n"
+                                + eventWith(R"("happened":-1,"id":6,)", R"("id":5,)") + "\n"
+                                + eventWith(R"("happened":604800,"id":7,)", R"("id":5,)"));
+    EXPECT_THAT(batch.badRows, IsEmpty());
+    ASSERT_THAT(batch.rows, SizeIs(6));
+    EXPECT_THAT(batch.rows[1].json, HasSubstr(R"("microseconds":2,)")); // of two that are as near, the even one
+    EXPECT_THAT(batch.rows[1].json, HasSubstr(R"("began_us":1795264505660000,)"));
+    EXPECT_THAT(batch.rows[2].json, HasSubstr(R"("microseconds":4294967295000000,)"));
+    EXPECT_THAT(batch.rows[3].json, HasSubstr(R"("happened_us":1795264500123457,)"));
+    EXPECT_THAT(batch.rows[4].json, HasSubstr(R"("happened_us":1795264505660000,)")); // no date expresses what it told
+    EXPECT_THAT(batch.rows[5].json, HasSubstr(R"("happened_us":604800000000,)"));
+    EXPECT_EQ(batch.rows[5].week, 1U);
+    EXPECT_EQ(batch.rows[1].week, 2968U);
+    EXPECT_EQ(batch.rows[2].week, 1'000'000U); // longer than a day
+
+    const auto volume = [](std::string_view text) {
+        std::string line = stretchLine(4);
+        line.replace(line.find(R"("volume":0.5)"), 12, fmt::format(R"("volume":{})", text));
+        const std::string json = batchOf(deviceLine(1, 9) + line).rows.at(1).json;
+        const std::size_t place = json.find("volume_millionths") + 19;
+        return json.substr(place, json.find(',', place) - place);
+    };
+    EXPECT_EQ(volume("0.12345649"), "123456");
+    EXPECT_EQ(volume("0.9999999"), "1000000");
+    EXPECT_EQ(volume("-1"), "0");
+    EXPECT_EQ(volume("1e300"), "1000000");
 }
 
 TEST(Batch, KeepsPayloadsAsTheyAre)
@@ -165,7 +204,7 @@ TEST(Batch, LeavesOutOptionalValuesThatDoNotFit)
     ASSERT_THAT(batch.rows, SizeIs(5));
     EXPECT_THAT(batch.rows[1].json, HasSubstr(R"("audio_device":"headset","application":"player","ending":"stopped")"));
     EXPECT_THAT(batch.rows[2].json, HasSubstr(R"("id":7,"application":"player","began":1795264400,)"));
-    EXPECT_THAT(batch.rows[3].json, Not(HasSubstr("happened")));
+    EXPECT_THAT(batch.rows[3].json, Not(HasSubstr(R"("happened":)")));
     EXPECT_THAT(batch.rows[4].json, Not(HasSubstr("application")));
 }
 

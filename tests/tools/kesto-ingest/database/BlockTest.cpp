@@ -104,9 +104,9 @@ TEST(InsertBlock, SuspectsTablesOfAnotherEditionAtOnce)
 
 TEST(ExceptionCode, IsTheNumberInTheAnswer)
 {
-    EXPECT_EQ(exceptionCode("Code: 27, e.displayText() = DB::Exception: Cannot parse input"), 27);
-    EXPECT_EQ(exceptionCode("http://host answered 500: Code: 60. DB::Exception"), 60);
-    EXPECT_EQ(exceptionCode("nginx: bad gateway"), 0);
+    EXPECT_EQ(fleet_database::exceptionCode("Code: 27, e.displayText() = DB::Exception: Cannot parse input"), 27);
+    EXPECT_EQ(fleet_database::exceptionCode("http://host answered 500: Code: 60. DB::Exception"), 60);
+    EXPECT_EQ(fleet_database::exceptionCode("nginx: bad gateway"), 0);
 }
 
 } // namespace

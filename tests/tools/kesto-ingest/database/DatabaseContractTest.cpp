@@ -17,7 +17,7 @@ namespace {
 using testing::HasSubstr;
 
 constexpr std::string_view goodRow =
-    R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":1,"time":1795264505.66,"name":"n","payload":"{}"})"
+    R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":1,"happened_us":1795264505660000,"time":1795264505.66,"name":"n","payload":"{}"})"
     "\n";
 // The database counts IDs without a sign.
 constexpr std::string_view badRow = R"({"device":"0123456789abcdef0123456789abcdef","id":-1})"
@@ -104,28 +104,30 @@ TEST(ClickHouseTables, HoldWhatRowsTell)
         EXPECT_EQ(provider.database().insert(name(row.table), row.json), InsertAnswer());
     EXPECT_EQ(
         server.select("SELECT device, epoch, id, time, happened, name, session, application, model, version, payload, "
-                      "audio_device, late_cycles, toMonday(toDateTime(toUInt32(time))) FROM events FORMAT CSV"),
+                      "audio_device, late_cycles, happened_us FROM events FORMAT CSV"),
         R"("0123456789abcdef0123456789abcdef","00000000000000000000000000000001",3,1795264505.66,\N,)"
         R"("com.quarn.kesto.Error.IssueDetector",7,"player","lamp","1.2",)"
-        R"("{""active_devices"":""café"",""late_cycles"":3}","café",3,"2026-11-16")");
+        R"("{""active_devices"":""café"",""late_cycles"":3}","café",3,1795264505660000)");
     EXPECT_EQ(server.select(
                   "SELECT id, recording, began, seconds, played_seconds, session, application, audio_device, format, "
-                  "channels, volume, ending, model FROM stretches FORMAT CSV"),
-              R"(4,0,1795264500.25,12.5,12.5,7,"player","headset","",2,0.5,"stopped","lamp")");
+                  "channels, volume, ending, model, began_us, microseconds, volume_millionths FROM stretches FORMAT CSV"),
+              R"(4,0,1795264500.25,12.5,12.5,7,"player","headset","",2,0.5,"stopped","lamp",)"
+              "1795264500250000,12500000,500000");
     EXPECT_EQ(server.select("SELECT id, reporter, began, ended, application FROM sessions FINAL FORMAT CSV"),
               R"(7,-5,1795264400,1795264600.125,"player")");
     EXPECT_EQ(server.select("SELECT first_id, last_id, sent, model, version FROM batches FORMAT CSV"),
               R"(1,9,1795264600.5,"lamp","1.2")");
-    EXPECT_EQ(server.select("SELECT DISTINCT partition FROM system.parts WHERE database = 'kesto' AND active"),
-              "2026-11-16");
+    EXPECT_EQ(server.select("SELECT DISTINCT partition FROM system.parts WHERE database = 'kesto' AND active "
+                            "ORDER BY partition FORMAT CSV"),
+              "\"('2026-11-16',0)\"\n\"2026-11-16\"");
 
     // A row that comes twice stays once, and a clock that is wrong makes no error.
     EXPECT_EQ(provider.database().insert("stretches", batch->rows[2].json), InsertAnswer());
     EXPECT_EQ(server.select("SELECT count() FROM stretches FINAL"), "1");
-    for (const std::string_view time : {"0", "0.5", "86400", "4294967295"})
+    for (const std::string_view time : {"0", "500000", "86400000000", "4294967295000000"})
         EXPECT_EQ(provider.database().insert(
                       "events",
-                      fmt::format(R"({{"device":"{}","epoch":"{}","id":99,"time":{},"name":"n","payload":"{{}}"}})"
+                      fmt::format(R"({{"device":"{}","epoch":"{}","id":99,"happened_us":{},"time":0,"name":"n","payload":"{{}}"}})"
                                   "\n",
                                   deviceA, epochA, time)),
                   InsertAnswer());

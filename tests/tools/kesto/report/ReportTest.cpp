@@ -68,8 +68,8 @@ Report reportOf(const History& history, TimeSpan span = {.from = 0, .until = 1'0
 std::vector<std::string> textOf(const std::vector<ReportLine>& lines)
 {
     std::vector<std::string> texts;
-    for (const auto& [key, played] : lines)
-        texts.push_back(fmt::format("{} {} {} {}", key, played.seconds, played.sessions, played.faults));
+    for (const ReportLine& line : lines)
+        texts.push_back(fmt::format("{} {} {} {}", line.key, line.played.seconds, line.played.sessions, line.played.faults));
     return texts;
 }
 

@@ -22,6 +22,8 @@ struct PageWords {
 [[nodiscard]] std::string volumeSection(const Report& report, const PageWords& words);
 [[nodiscard]] std::string faultSection(const Report& report, const PageWords& words);
 [[nodiscard]] std::string worstSection(const Report& report, const PageWords& words);
+// Nothing of the report of a device.
+[[nodiscard]] std::string fleetSection(const Report& report, const PageWords& words);
 
 // A table behind a picture, closed until somebody opens it. The first column of each row is its heading. All is HTML.
 struct PageTable {

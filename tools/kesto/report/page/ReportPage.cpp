@@ -21,6 +21,8 @@ std::string daysOf(const Report& report)
 
 std::string_view titleOf(const Report& report)
 {
+    if (report.fleet)
+        return report.isRecording ? "Report of a fleet's recordings" : "Audio report of a fleet";
     return report.isRecording ? "Report of recordings" : "Audio report";
 }
 
@@ -76,10 +78,10 @@ std::string tiles(const Report& report, const PageWords& words)
 std::string sections(const Report& report, const PageWords& words)
 {
     if (report.all.seconds <= 0 && report.all.faults == 0)
-        return fmt::format("<section><h2>Nothing was {}</h2><p class=sub>The event store has nothing of this time.</p>"
+        return fmt::format("<section><h2>Nothing was {}</h2><p class=sub>The {} has nothing of this time.</p>"
                            "</section>",
-                           words.played());
-    return timeSection(report, words) + "<div class=two>" + deviceSection(report, words) + volumeSection(report, words)
+                           words.played(), report.fleet ? "database" : "event store");
+    return timeSection(report, words) + fleetSection(report, words) + "<div class=two>" + deviceSection(report, words) + volumeSection(report, words)
         + "</div>" + faultSection(report, words) + worstSection(report, words);
 }
 

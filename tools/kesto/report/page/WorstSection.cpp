@@ -188,9 +188,11 @@ std::string who(const HistorySession& session)
 
 std::string rowOf(const WorstSession& worst, const TimeSpan& span, const PageWords& words)
 {
-    return fmt::format("<tr><th scope=row>{}<td class=l>{}<td class=l>{}<td class=l><bdi>{}</bdi><td>{}<td>{}<td>{}"
+    const std::string unit =
+        worst.unit.empty() ? "" : fmt::format("<br><span class=sub>{}</span>", htmlText(worst.unit, longestName));
+    return fmt::format("<tr><th scope=row>{}{}<td class=l>{}<td class=l>{}<td class=l><bdi>{}</bdi><td>{}<td>{}<td>{}"
                        "<td>{}<td class=l>{}<td class=l>{}",
-                       worst.session.id, dayAndTimeText(worst.session.began, span, words.isUTC), who(worst.session),
+                       worst.session.id, unit, dayAndTimeText(worst.session.began, span, words.isUTC), who(worst.session),
                        htmlDevices(worst.devices, longestLabel), durationText(worst.played.seconds),
                        worst.played.faults, worst.lateCycles, rateText(worst.played.faultsAnHour()),
                        Timeline(worst, span, words).draw(), endOf(worst, span, words));

@@ -1,0 +1,222 @@
+// SPDX-License-Identifier: Apache-2.0
+// What the report of a fleet adds to that of a device: models, releases and distributions over units; and what it does
+// with rows that come twice, with names that are made to harm, and with a database that it cannot ask.
+#include "kesto/report/fleet/FleetQueries.h"
+#include "kesto/store/EventDatabase.h"
+#include "tools/kesto/report/fleet/Fleet.h"
+
+#include <fmt/format.h>
+#include <gmock/gmock.h>
+
+namespace kesto_tool {
+namespace {
+
+using foundation::Dictionary;
+using foundation::Value;
+using testing::HasSubstr;
+
+const std::string unit1(32, '1');
+const std::string unit2(32, '2');
+const std::string unit3(32, '3');
+constexpr double monday = 1794787200; // 16 November 2026
+const Tool::Arguments thatWeek{"--utc", "--since", "2026-11-16", "--until", "2026-11-23"};
+
+Tool::Arguments inThatWeek(const Tool::Arguments& more)
+{
+    Tool::Arguments arguments = thatWeek;
+    arguments.insert(arguments.end(), more.begin(), more.end());
+    return arguments;
+}
+
+std::string stretch(int id, int session, double hoursAfterMonday, double hours, const std::string& application,
+                    const std::string& more = R"("device_name":"speaker","format":"S16LE/48000/2","volume":0.5)")
+{
+    return fmt::format(R"("kind":"stretch","id":{},"recording":false,"began":{},"seconds":{},"session":{},)"
+                       R"("application":{},"ending":"stopped",{}}})"
+                       "\n",
+                       id, monday + hoursAfterMonday * 3600, hours * 3600, session, application, more);
+}
+
+std::string fault(int id, int session, double hoursAfterMonday, const std::string& payload = R"({"late_cycles":1})")
+{
+    return fmt::format(R"("kind":"event","id":{},"time":{},"name":"com.quarn.kesto.Error.Overload","session":{},)"
+                       R"("application":"player","payload":{}}})"
+                       "\n",
+                       id, monday + hoursAfterMonday * 3600, session, payload);
+}
+
+std::string faults(int first, int count, int session, double hoursAfterMonday)
+{
+    std::string lines;
+    for (int index = 0; index < count; ++index)
+        lines += fault(first + index, session, hoursAfterMonday);
+    return lines;
+}
+
+std::string session(int id, const std::string& more)
+{
+    return fmt::format(R"("kind":"session","id":{},"began":{},"application":"player","process":"a player"{}}})"
+                       "\n",
+                       id, monday, more);
+}
+
+std::string at(const Dictionary& dictionary, std::string_view key)
+{
+    const Value* const value = dictionary.find(key);
+    return value == nullptr ? "not there" : value->text();
+}
+
+// 0.5, 2 and 6 faults an hour; the last played for half an hour only.
+class ThreeUnits : public FleetReports {
+protected:
+    ThreeUnits()
+    {
+        for (int time = 0; time < 2; ++time) { // each row comes twice
+            insertLines(unit1,
+                        stretch(1, 1, 1, 2, "\"player\"") + faults(2, 1, 1, 2) + session(1, R"(,"ended":1794800000)")
+                            + session(1, ""));
+            insertLines(unit2, stretch(1, 1, 22, 4, "\"player\"") + faults(2, 8, 1, 23), "lamp", "1.3");
+            insertLines(unit3,
+                        stretch(1, 1, 1, 0.25, "\"browser\"") + stretch(2, 2, 5, 0.25, "\"player\"")
+                            + faults(3, 3, 1, 1.1),
+                        "radio", "1.3");
+        }
+    }
+};
+
+TEST_F(ThreeUnits, AreComparedAndEachRowCountsOnce)
+{
+    const Dictionary report = json(thatWeek);
+    EXPECT_EQ(at(report, "seconds"), "23400");
+    EXPECT_EQ(at(report, "sessions"), "4");
+    EXPECT_EQ(at(report, "faults"), "12");
+    EXPECT_EQ(at(report, "units"), "3");
+    EXPECT_EQ(at(report, "hours_of_units"), R"({"median":2,"ninetieth":4,"most":4})");
+    EXPECT_EQ(at(report, "units_compared"), "2");
+    EXPECT_EQ(at(report, "faults_an_hour_of_units"), R"({"median":2,"ninetieth":2,"most":2})");
+    EXPECT_EQ(at(report, "sessions_with_faults"), "3");
+    EXPECT_EQ(at(report, "running"), "not there");
+    EXPECT_EQ(at(report, "models"),
+              R"([{"model":"lamp","units":2,"units_compared":2,"faults_an_hour_of_units":{"median":2,"ninetieth":2,)"
+              R"("most":2},"seconds":21600,"muted_seconds":0,"no_volume_seconds":0,"mean_volume":0.5,"sessions":2,)"
+              R"("faults":9,"faults_an_hour":1.5},{"model":"radio","units":1,"units_compared":0,)"
+              R"("faults_an_hour_of_units":null,"seconds":1800,"muted_seconds":0,"no_volume_seconds":0,)"
+              R"("mean_volume":0.5,"sessions":2,"faults":3,"faults_an_hour":6}])");
+    EXPECT_EQ(at(report, "worst_units"),
+              fmt::format(R"([{{"unit":"{}","model":"lamp","version":"1.3","seconds":14400,"muted_seconds":0,)"
+                          R"("no_volume_seconds":0,"mean_volume":0.5,"sessions":1,"faults":8,"faults_an_hour":2}},)"
+                          R"({{"unit":"{}","model":"lamp","version":"1.2","seconds":7200,"muted_seconds":0,)"
+                          R"("no_volume_seconds":0,"mean_volume":0.5,"sessions":1,"faults":1,"faults_an_hour":0.5}}])",
+                          unit2, unit1));
+    const auto worst = report.find("worst_sessions")->array().value();
+    ASSERT_EQ(worst.size(), 3U);
+    EXPECT_EQ(at(*worst[0].dictionary(), "unit"), unit2);
+    EXPECT_EQ(at(*worst[0].dictionary(), "late_cycles"), "8");
+    EXPECT_EQ(at(*worst[2].dictionary(), "unit"), unit1);
+    EXPECT_EQ(at(*worst[2].dictionary(), "process"), "a player");
+}
+
+TEST_F(ThreeUnits, AreTablesForProgramsAndForPeople)
+{
+    EXPECT_EQ(print(inThatWeek({"--csv"})),
+              "day,seconds,sessions,faults,mean_volume\n2026-11-16,16200.0,4,12,0.5\n2026-11-17,7200.0,1,0,0.5\n"
+              "2026-11-18,0.0,0,0,\n2026-11-19,0.0,0,0,\n2026-11-20,0.0,0,0,\n2026-11-21,0.0,0,0,\n"
+              "2026-11-22,0.0,0,0,\n");
+    EXPECT_EQ(print(inThatWeek({"--csv", "--by", "version"})),
+              "version,seconds,sessions,faults,mean_volume,units,median_faults_an_hour,ninetieth_faults_an_hour,"
+              "most_faults_an_hour\n"
+              "1.3,16200.0,3,11,0.5,2,2.0,2.0,2.0\n1.2,7200.0,1,1,0.5,1,0.5,0.5,0.5\n");
+    EXPECT_EQ(print(inThatWeek({"--csv", "--by", "unit"})),
+              fmt::format("unit,seconds,sessions,faults,mean_volume\n{},14400.0,1,8,0.5\n{},7200.0,1,1,0.5\n"
+                          "{},1800.0,2,3,0.5\n",
+                          unit2, unit1, unit3));
+    EXPECT_THAT(print(inThatWeek({"--csv", "--by", "volume"})), HasSubstr("\n0.4375,0.0\n0.5,23400.0\n0.5625,0.0\n"));
+    EXPECT_EQ(print(inThatWeek({"--csv", "--by", "fault"})), "fault,faults,sessions\nOverload,12,3\n");
+    EXPECT_THAT(print(inThatWeek({"--csv", "--unit", unit1})),
+                HasSubstr("mean_volume\n2026-11-16,7200.0,1,1,0.5\n2026-11-17,0.0,0,0,\n"));
+    const std::string text = print(inThatWeek({"--by", "application"}));
+    EXPECT_THAT(text, HasSubstr("6.5 h played in 4 sessions · 12 faults, 1.85 an hour\n"
+                                "3 units; a unit played: median 2.0 h, 90 % up to 4.0 h, most 4.0 h\n"
+                                "faults an hour of a unit: median 2.00, 90 % up to 2.00, worst 2.00; of 2 that played "
+                                "an hour or more\n"));
+    EXPECT_THAT(text,
+                HasSubstr("APPLICATION   PLAYED  SHARE  VOLUME  FAULTS  /HOUR  UNITS  MEDIAN   90 %  WORST\n"
+                          "player         6.2 h   96 %    50 %"));
+    EXPECT_THAT(print(thatWeek), HasSubstr("browser"));
+}
+
+TEST_F(FleetReports, SayThatNothingWasPlayed)
+{
+    EXPECT_THAT(print(thatWeek), HasSubstr("Nothing that matches was played between 2026-11-16 00:00 and 2026-11-23 "
+                                           "00:00 on any unit whose reports have come.\n"));
+    EXPECT_EQ(at(json(thatWeek), "hours_of_units"), "(null)");
+    EXPECT_EQ(at(json(inThatWeek({"--recording"})), "units"), "0");
+}
+
+TEST_F(FleetReports, TakeNamesForNamesOnly)
+{
+    const std::string harmful = "\\\\'; DROP TABLE kesto.stretches; --\\\"\\n`\\u0001";
+    insertLines(unit1, stretch(1, 1, 1, 2, "\"" + harmful + "\"") + stretch(2, 1, 4, 1, "\"it's\""));
+    EXPECT_EQ(at(json(inThatWeek({"--application", "it's"})), "seconds"), "3600");
+    EXPECT_EQ(at(json(inThatWeek({"--application", "\\'; DROP TABLE kesto.stretches; --\"\n`\x01"})), "seconds"),
+              "7200");
+    EXPECT_EQ(at(json(inThatWeek({"--device", "'); DROP TABLE kesto.stretches; --"})), "seconds"), "0");
+    const auto applications = json(thatWeek).find("applications")->array().value();
+    ASSERT_EQ(applications.size(), 2U);
+    EXPECT_EQ(at(*applications[0].dictionary(), "application"), "\\'; DROP TABLE kesto.stretches; --\"\n`\x01");
+}
+
+// SQLite itself says what matches.
+TEST_F(FleetReports, MatchAsTheReportOfADeviceDoes)
+{
+    const std::vector<std::string> names{"",    "a",    "A",     "ab",   "a.b", "a\nb", "aéb", "é",  "]",
+                                         "[",   "^",    "-",     "a-b",  "*",   "?",    "a?b", "\\", "a\\b",
+                                         "org", "x{2}", "(a|b)", "a'b", "z",   "ü",    "日本", "$",  "a$"};
+    const std::vector<std::string> globs{"*",      "?",       "a*",   "*b",      "a?b",    "[a-c]*", "[^a-c]*", "[]]",
+                                         "[^]]",   "[a",      "a[]b", "[a-]",    "[-a]",   "[z-a]",  "[é-ü]",   "[^é]",
+                                         "\\*",    "a\\b",    "a.b",  "x{2}",    "(a|b)",  "a'b",    "[*]",     "[?]",
+                                         "a[?]b",  "*[é]*",   "??",   "日?",     "[\\]",   "[^^]",   "[[]",     "$",
+                                         "a$",     "[a-c-z]", "",     "*a*b*",   "[.-.]",  "[!a]",   "^",       "[^-]"};
+    for (const std::string& glob : globs)
+        for (const std::string& name : names)
+            EXPECT_EQ(server.select(
+                          fmt::format("SELECT match({}, {})", sqlText(name), sqlText(regularExpression(glob)))),
+                      matches(name, glob) ? "1" : "0")
+                << "\"" << name << "\" " << glob << " " << regularExpression(glob);
+}
+
+TEST_F(FleetReports, SayWhyTheDatabaseCannotBeAsked)
+{
+    EXPECT_EQ(server.select("DROP TABLE edition"), "");
+    EXPECT_THAT(failure({}), HasSubstr("the database kesto has no tables: make them by `kesto-ingest tables | "));
+    EXPECT_EQ(server.select("CREATE VIEW edition AS SELECT toUInt64(7) AS edition"), "");
+    EXPECT_EQ(failure({}),
+              "kesto: the tables in the database kesto are of edition 7, and this program reads edition 1: update the "
+              "older of the two\n");
+    EXPECT_THAT(failure({"--fleet-database", "other"}), HasSubstr("the database other has no tables"));
+    support::writeFile(directory / "credentials", "user = \"nobody\"\npassword = \"wrong\"\n");
+    std::filesystem::permissions(directory / "credentials", std::filesystem::perms(0644));
+    EXPECT_THAT(failure({"--credentials", directory / "credentials"}), HasSubstr("everybody may read it: chmod o-r"));
+    std::filesystem::permissions(directory / "credentials", std::filesystem::perms(0600));
+    EXPECT_THAT(failure({"--credentials", directory / "credentials"}),
+                HasSubstr("the database does not let the user nobody in: name a file with another user and password by "
+                          "--credentials"));
+    EXPECT_EQ(server.select("DROP TABLE edition"), "");
+    EXPECT_EQ(server.select("CREATE VIEW edition AS SELECT toUInt64(1) AS edition"), "");
+    EXPECT_EQ(server.select("DROP TABLE stretches"), "");
+    EXPECT_THAT(failure({}), HasSubstr("the database of the fleet refuses a question: "));
+    server.end();
+    EXPECT_THAT(failure({}), HasSubstr("the database of the fleet cannot be asked: http://127.0.0.1:"));
+}
+
+TEST_F(FleetReports, AreAskedForByARightCommandLine)
+{
+    EXPECT_EQ(tool.run({"report", "--by", "model"}).status, 2);
+    EXPECT_EQ(tool.run({"report", "--unit", unit1}).status, 2);
+    EXPECT_EQ(tool.run({"report", "--fleet", "127.0.0.1:8123"}).status, 2);
+    EXPECT_EQ(tool.run(withFleet({"--unit", "x'"})).status, 2);
+    EXPECT_EQ(tool.run(withFleet({"--database", "x"})).status, 2);
+}
+
+} // namespace
+} // namespace kesto_tool

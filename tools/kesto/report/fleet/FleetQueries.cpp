@@ -1,0 +1,452 @@
+// SPDX-License-Identifier: Apache-2.0
+// Names of columns within a query: u is the hash of the unit, s of its session, i of its row, k the key; n and r are the
+// numbers of session and row in the device's store. us is how long in microseconds, v the volume in millionths or -1, and
+// f is 1 of a fault. Sums are of whole numbers.
+//
+// A subquery of a distributed table in another's condition is GLOBAL: the first server asks it once for all.
+#include "kesto/report/fleet/FleetQueries.h"
+
+#include "foundation/values/Microseconds.h"
+#include "kesto/report/Report.h"
+
+#include <fmt/format.h>
+#include <fmt/ranges.h>
+#include <utility>
+
+namespace {
+
+constexpr std::string_view unitHash = "cityHash64(device)";
+constexpr std::string_view storeHash = "cityHash64(device, epoch)";
+constexpr std::string_view sessionHash = "cityHash64(epoch, session)";
+// As of a piece of a stretch of the device's own report.
+constexpr std::string_view figures = "sum(us), sumIf(us, v = 0), sumIf(us, v < 0),"
+                                     " sum(toInt64(round(us * (greatest(v, 0) / 1000000))))";
+constexpr std::string_view faultsAnHour = "3600000000 * faults / played";
+constexpr double microsecondsAnHour = 3'600'000'000;
+constexpr std::int64_t microsecondsADay = 86'400'000'000;
+
+// A character behind a backslash stands for itself.
+void appendLiteral(char character, std::string& expression)
+{
+    const bool isWord = (character >= '0' && character <= '9') || (character >= 'a' && character <= 'z')
+        || (character >= 'A' && character <= 'Z') || character == '_' || static_cast<unsigned char>(character) >= 0x80;
+    if (!isWord)
+        expression += '\\';
+    expression += character;
+}
+
+// The bytes of the character that begins there.
+std::string_view characterAt(std::string_view text, std::size_t place)
+{
+    std::size_t end = place + 1;
+    while (end < text.size() && (static_cast<unsigned char>(text[end]) & 0xc0) == 0x80)
+        ++end;
+    return text.substr(place, end - place);
+}
+
+void appendCharacter(std::string_view character, std::string& expression)
+{
+    for (const char byte : character)
+        appendLiteral(byte, expression);
+}
+
+// The set behind a "[" at that place, which moves behind its "]". Empty if it has no end: then nothing matches.
+std::string setAt(std::string_view glob, std::size_t& place)
+{
+    std::string set = "[";
+    const auto isAt = [&](char character) { return place < glob.size() && glob[place] == character; };
+    if (isAt('^')) {
+        set += '^';
+        ++place;
+    }
+    std::string_view before; // may begin a range
+    for (bool isFirst = true; place < glob.size(); isFirst = false) {
+        if (glob[place] == ']' && !isFirst)
+            return ++place, set + ']';
+        const bool isRange = glob[place] == '-' && !before.empty() && place + 1 < glob.size() && glob[place + 1] != ']';
+        place += isRange ? 1 : 0;
+        const std::string_view character = characterAt(glob, place);
+        place += character.size();
+        if (!isRange) {
+            appendCharacter(character, set);
+            before = character;
+            continue;
+        }
+        if (before <= character) { // bytes of UTF-8 are in the order of their characters
+            set += '-';
+            appendCharacter(character, set);
+        }
+        before = {};
+    }
+    return {};
+}
+
+} // namespace
+
+std::string sqlText(std::string_view text)
+{
+    std::string literal = "'";
+    for (const char character : text) {
+        if (character == '\'' || character == '\\')
+            literal += '\\';
+        literal += character;
+    }
+    return literal + '\'';
+}
+
+std::string regularExpression(std::string_view glob)
+{
+    std::string expression = "^";
+    for (std::size_t place = 0; place < glob.size();) {
+        const std::string_view character = characterAt(glob, place);
+        place += character.size();
+        if (character == "*")
+            expression += "(.|\\n)*";
+        else if (character == "?")
+            expression += "(.|\\n)";
+        else if (character != "[")
+            appendCharacter(character, expression);
+        else if (const std::string set = setAt(glob, place); !set.empty())
+            expression += set;
+        else
+            return "^$a"; // nothing
+    }
+    return expression + '$';
+}
+
+FleetQueries::FleetQueries(FleetQuestion question, const std::vector<std::int64_t>& days)
+    : question_(std::move(question)),
+      days_(days),
+      from_(foundation::wholeMicroseconds(question_.history.span.from)),
+      until_(foundation::wholeMicroseconds(question_.history.span.until))
+{
+}
+
+// The rows of this second count.
+std::string FleetQueries::present()
+{
+    return "SELECT toUInt32(now()) + 1";
+}
+
+void FleetQueries::setDoubled(const std::vector<std::string>& units)
+{
+    areManyDoubled_ = units.size() > mostNamed;
+    doubled_ = areManyDoubled_ ? "" : fmt::format("{}", fmt::join(units, ","));
+}
+
+// --- Conditions
+
+std::string FleetQueries::unitCondition() const
+{
+    return question_.unit.empty() ? std::string() : fmt::format(" AND device = {}", sqlText(question_.unit));
+}
+
+// Of stretches, whatever they did. Few are longer than a day; these have partitions of their own. With stretches that
+// only touch the span it is wide, as a history is.
+std::string FleetQueries::touching(bool isWide) const
+{
+    constexpr std::int64_t rounding = 10;
+    const std::int64_t from = from_ - (isWide ? rounding : 0);
+    const std::int64_t until = until_ + (isWide ? rounding : 0);
+    return fmt::format("began_us < {} AND began_us + microseconds > {} AND (began_us > {} OR microseconds > {})"
+                       " AND received < toDateTime({}){}",
+                       until, from, from - microsecondsADay - 1, microsecondsADay, present_, unitCondition());
+}
+
+namespace {
+
+std::string matching(std::string_view column, const std::string& glob)
+{
+    return glob == "*" ? "" : fmt::format(" AND match({}, {})", column, sqlText(regularExpression(glob)));
+}
+
+} // namespace
+
+// --- Faults
+
+// Those of an application that is asked for; `withDirection` leaves out those whose session did only the other.
+std::string FleetQueries::faults(bool withDevices) const
+{
+    const HistoryQuestion& asked = question_.history;
+    std::string each = fmt::format(
+        "SELECT {} AS u, {} AS st, {} AS s, device AS unit, epoch, session, happened_us AS happened,"
+        " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
+        " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM events"
+        " WHERE name LIKE 'com.quarn.kesto.Error.%' AND happened_us >= {} AND happened_us < {}"
+        " AND received < toDateTime({}){}{}{} LIMIT 1 BY device, epoch, id",
+        unitHash, storeHash, sessionHash, std::string_view("com.quarn.kesto.Error.").size() + 1, from_, until_, present_,
+        unitCondition(), matching("application", asked.applications), direction_);
+    if (!withDevices)
+        return each;
+    // A fault without a device is on that on which its session played then; in between, before it.
+    const std::string played = fmt::format(
+        "SELECT {} AS st, session, arraySort(groupArray((began_us, id, audio_device, format))) AS own FROM stretches"
+        " WHERE recording = {} AND {} AND ({}, session) GLOBAL IN ({}) GROUP BY st, session",
+        storeHash, asked.isRecording ? 1 : 0, touching(true), storeHash, sessionsWithFault(true));
+    return fmt::format(
+        "SELECT * FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late,"
+        " greatest(arrayCount(x -> x.1 <= happened, own), 1) + 0 * happened AS place,"
+        " if(named = '' AND session != 0, arrayMap(x -> x.3, own)[place], named) AS device,"
+        " if(session != 0, arrayMap(x -> x.4, own)[place], '') AS format"
+        " FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late, named, own"
+        " FROM ({}) ANY LEFT JOIN ({}) USING (st, session))) WHERE 1{}",
+        each, played, matching("device", asked.devices));
+}
+
+std::string FleetQueries::sessionsWithFault(bool withDirection) const
+{
+    return fmt::format("SELECT {} AS st, session FROM events WHERE name LIKE 'com.quarn.kesto.Error.%'"
+                       " AND happened_us >= {} AND happened_us < {}{}{}",
+                       storeHash, from_, until_, unitCondition(), withDirection ? direction_ : "");
+}
+
+std::string FleetQueries::recordings() const
+{
+    return fmt::format("SELECT toString({} AS st), toString(session) FROM stretches WHERE recording = 1 AND {}"
+                       " AND (st, session) GLOBAL IN ({}) GROUP BY st, session LIMIT {}",
+                       storeHash, touching(true), sessionsWithFault(false), mostNamed + 1);
+}
+
+std::string FleetQueries::onlyRecordings(const std::string& sessions) const
+{
+    return fmt::format("SELECT {} AS st, session FROM stretches WHERE {} AND (st, session) GLOBAL IN ({})"
+                       " GROUP BY st, session HAVING min(recording) = 1",
+                       storeHash, touching(true), sessions);
+}
+
+void FleetQueries::setRecordings(const std::vector<FleetSession>& sessions)
+{
+    const bool isRecording = question_.history.isRecording;
+    direction_ = isRecording ? " AND 0" : "";
+    if (sessions.empty())
+        return;
+    std::string list;
+    for (const FleetSession& each : sessions)
+        list += fmt::format("{}({},{})", list.empty() ? "" : ",", each.store, each.session);
+    if (sessions.size() > mostNamed)
+        list = fmt::format("SELECT {} AS st, session FROM stretches WHERE recording = 1 AND {}", storeHash,
+                           touching(true));
+    direction_ = fmt::format(" AND ({}, session) GLOBAL {} ({})", storeHash, isRecording ? "IN" : "NOT IN",
+                             isRecording ? list : onlyRecordings(list));
+}
+
+// --- Rows
+
+bool FleetQueries::needsDevices(std::string_view by) const
+{
+    return by == "audio_device" || by == "format" || question_.history.devices != "*";
+}
+
+// With the columns of a row, and `key` as an expression of the columns of the table and of `begins` and `ends`.
+std::string FleetQueries::stretchRows(std::string_view key, const std::string& condition) const
+{
+    const HistoryQuestion& asked = question_.history;
+    return fmt::format(
+        "SELECT {} AS u, {} AS s, cityHash64(epoch, id) AS i, session AS n, id AS r, greatest(began_us, {}) AS begins,"
+        " least(began_us + microseconds, {}) AS ends, {}, ifNull(toInt64(volume_millionths), -1) AS v,"
+        " toUInt8(ending = 'vanished' AND began_us + microseconds <= {}) AS gone, toUInt64(0) AS f FROM stretches"
+        " WHERE recording = {} AND {}{}{}{}",
+        unitHash, sessionHash, from_, until_, key, until_, asked.isRecording ? 1 : 0, touching(false),
+        matching("application", asked.applications), matching("audio_device", asked.devices), condition);
+}
+
+// Each row once, also where the database has it twice.
+std::string FleetQueries::onceEach(std::string_view key, const std::string& condition) const
+{
+    constexpr std::string_view columns = "u, s, i, n, r, us, v, gone, f, k";
+    if (areManyDoubled_)
+        return fmt::format("SELECT {} FROM ({} LIMIT 1 BY u, i, k)", columns, stretchRows(key, condition));
+    if (doubled_.empty())
+        return fmt::format("SELECT {} FROM ({})", columns, stretchRows(key, condition));
+    return fmt::format("SELECT {0} FROM ({1}) UNION ALL SELECT {0} FROM ({2} LIMIT 1 BY u, i, k)", columns,
+                       stretchRows(key, fmt::format("{} AND {} NOT IN ({})", condition, unitHash, doubled_)),
+                       stretchRows(key, fmt::format("{} AND {} IN ({})", condition, unitHash, doubled_)));
+}
+
+namespace {
+
+// A fault as a row.
+std::string faultRow(std::string_view key, const std::string& faults)
+{
+    return fmt::format("SELECT u, s, toUInt64(0) AS i, session AS n, toUInt64(0) AS r, toInt64(0) AS us,"
+                       " toInt64(-1) AS v, toUInt8(0) AS gone, toUInt64(1) AS f, {} AS k FROM ({})",
+                       key, faults);
+}
+
+// What `by` is called of a fault.
+std::string_view ofFault(std::string_view by)
+{
+    return by == "audio_device" ? "device" : by;
+}
+
+} // namespace
+
+// Few stretches are in more than one day. `key` is an expression of the columns and of `day`.
+std::string FleetQueries::daysOfStretches(const std::string& key, const std::string& condition) const
+{
+    const std::string both = fmt::format("{}, {}", days_.of("begins", "first"), days_.of("(ends - 1)", "last"));
+    const std::string whole = fmt::format("{}, first AS day, ends - begins AS us, {} AS k", both, key);
+    const std::string parts =
+        fmt::format("{}, first + arrayJoin(range(toUInt64(last - first + 1))) AS day,"
+                    " least(ends, {}) - greatest(begins, {}) AS us, {} AS k",
+                    both, days_.beginning("(day + 1)"), days_.beginning("day"), key);
+    return fmt::format("{} UNION ALL {}", onceEach(whole, condition + " AND first = last"),
+                       onceEach(parts, condition + " AND first != last"));
+}
+
+std::string FleetQueries::rows(std::string_view by, bool isHashed) const
+{
+    const auto hashed = [isHashed](std::string_view key) {
+        return isHashed ? fmt::format("cityHash64({})", key) : std::string(key);
+    };
+    const std::string all = faults(needsDevices(by));
+    if (by == "day")
+        return fmt::format("{} UNION ALL {}", daysOfStretches(hashed("day"), ""),
+                           faultRow(hashed(fmt::format("({})", days_.of("happened", "day"))), all));
+    const bool isByStore = by.empty();
+    const std::string ofStretch = isByStore ? std::string(storeHash) : hashed(by);
+    return fmt::format("{} UNION ALL {}", onceEach(fmt::format("ends - begins AS us, {} AS k", ofStretch), ""),
+                       faultRow(isByStore ? "cityHash64(unit, epoch)" : hashed(ofFault(by)), all));
+}
+
+std::string FleetQueries::daysOf(std::string_view by, const std::vector<std::string>& keys) const
+{
+    std::string list;
+    for (const std::string& key : keys)
+        list += (list.empty() ? "" : ",") + sqlText(key);
+    const std::string ofStretches = daysOfStretches(fmt::format("concat(toString(day), ' ', {})", by),
+                                                    fmt::format(" AND {} IN ({})", by, list));
+    const std::string ofFaults =
+        faultRow(fmt::format("concat(toString({}), ' ', {})", days_.of("happened", "day"), ofFault(by)),
+                 faults(needsDevices(by)));
+    return fmt::format("SELECT k, '', {}, sum(f) FROM ({} UNION ALL {} WHERE {} IN ({})) GROUP BY k", figures,
+                       ofStretches, ofFaults, ofFault(by), list);
+}
+
+// --- Queries
+
+namespace {
+
+std::string distribution(std::string_view figure, std::string_view condition)
+{
+    return fmt::format("quantileExactIf(0.5)({0}, {1}), quantileExactIf(0.9)({0}, {1}), maxIf({0}, {1})", figure,
+                       condition);
+}
+
+std::string isAboveFloor()
+{
+    return fmt::format("played >= {:.0f}", FleetPart::leastHours * microsecondsAnHour);
+}
+
+} // namespace
+
+// By store first: its numbers say what is the same, without their epoch.
+std::string FleetQueries::all() const
+{
+    const std::string floor = isAboveFloor();
+    return fmt::format(
+        "SELECT sum(played), sum(muted), sum(without), sum(volume), sum(faults), sum(sessions), sum(vanished),"
+        " countIf(sessions > 0), {}, countIf({}), {}, groupArrayIf({})(toString(u), all != different),"
+        " arrayMap(x -> toString(x.2), arraySlice(arrayReverseSort(groupArrayIf(({}, u), faults > 0 AND {})), 1, 10))"
+        " FROM (SELECT u1 AS u, sum(played1) AS played, sum(muted1) AS muted, sum(without1) AS without,"
+        " sum(volume1) AS volume, sum(faults1) AS faults, sum(sessions1) AS sessions, sum(vanished1) AS vanished,"
+        " sum(rows1) AS all, sum(different1) AS different FROM (SELECT any(u) AS u1, sum(us) AS played1,"
+        " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS without1,"
+        " sum(toInt64(round(us * (greatest(v, 0) / 1000000)))) AS volume1, sum(f) AS faults1,"
+        " uniqExactIf(n, f = 0) AS sessions1, uniqExactIf(n, gone) AS vanished1, countIf(f = 0) AS rows1,"
+        " uniqExactIf(r, f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
+        distribution("played", "sessions > 0"), floor, distribution(faultsAnHour, floor), mostNamed + 1, faultsAnHour,
+        floor, rows("", false));
+}
+
+std::string FleetQueries::sums(std::string_view by) const
+{
+    return fmt::format("SELECT k, toString(cityHash64(k)), {}, sum(f) FROM ({}) GROUP BY k", figures, rows(by, false));
+}
+
+std::string FleetQueries::overUnits(std::string_view by) const
+{
+    const std::string floor = isAboveFloor();
+    return fmt::format("SELECT toString(k), sum(sessions), countIf(sessions > 0), countIf({0}), {1} FROM (SELECT u, k,"
+                       " sum(us) AS played, uniqExactIf(s, f = 0) AS sessions, sum(f) AS faults FROM ({2})"
+                       " GROUP BY u, k) GROUP BY k",
+                       floor, distribution(faultsAnHour, floor), rows(by, true));
+}
+
+std::string FleetQueries::volumes() const
+{
+    return fmt::format("SELECT intDiv(v * 16 - 1, 1000000) AS step, sum(us) FROM ({}) WHERE v > 0 GROUP BY step",
+                       onceEach("ends - begins AS us, toUInt64(0) AS k", ""));
+}
+
+std::string FleetQueries::faultKinds() const
+{
+    return fmt::format("SELECT kind, count(), uniqExact(u, s) FROM ({}) GROUP BY kind", faults(needsDevices("")));
+}
+
+std::string FleetQueries::sessionsWithFaults() const
+{
+    return fmt::format("SELECT uniqExact(u, s) FROM ({}) WHERE session != 0", faults(needsDevices("")));
+}
+
+std::string FleetQueries::sessionsThatPlayedWithFaults() const
+{
+    return fmt::format("SELECT uniqExact(u, s) FROM ({}) WHERE (u, s) GLOBAL IN (SELECT u, s FROM ({}) WHERE session"
+                       " != 0)",
+                       stretchRows("toUInt64(0) AS k", ""), faults(needsDevices("")));
+}
+
+std::string FleetQueries::units(const std::vector<std::string>& hashes) const
+{
+    const std::string chosen =
+        hashes.empty() ? "" : fmt::format(" AND {} IN ({})", unitHash, fmt::join(hashes, ","));
+    const std::string ofFaults = fmt::format(
+        "SELECT unit AS name, s, toInt64(0) AS us, toInt64(-1) AS v, toUInt64(1) AS f, model AS m, version AS r"
+        " FROM ({})"
+        " WHERE 1{}",
+        faults(needsDevices("")), hashes.empty() ? "" : fmt::format(" AND u IN ({})", fmt::join(hashes, ",")));
+    const std::string ofStretches = onceEach("ends - begins AS us, (device, model, version) AS k", chosen);
+    return fmt::format("SELECT name, any(m), any(r), {}, sum(f), uniqExactIf(s, f = 0) FROM (SELECT k.1 AS name, s, us, v,"
+                       " f, k.2 AS m, k.3 AS r FROM ({}) UNION ALL {}) GROUP BY name",
+                       figures, ofStretches, ofFaults);
+}
+
+std::string FleetQueries::worstSessions() const
+{
+    return fmt::format("SELECT unit, epoch, toString(session), sum(late) AS cycles, count() AS faults FROM ({})"
+                       " WHERE session != 0 GROUP BY unit, epoch, session"
+                       " ORDER BY cycles DESC, faults DESC, unit, epoch, session LIMIT 10",
+                       faults(needsDevices("")));
+}
+
+std::string FleetQueries::sessionList(const std::vector<std::vector<std::string>>& sessions)
+{
+    std::string list;
+    for (const auto& each : sessions)
+        list += fmt::format("{}({},{},{})", list.empty() ? "" : ",", sqlText(each.at(0)), sqlText(each.at(1)),
+                            each.at(2));
+    return list;
+}
+
+std::string FleetQueries::stretchesOf(const std::string& sessions) const
+{
+    return fmt::format("SELECT device, epoch, toString(session), began_us, microseconds, audio_device, format,"
+                       " volume_millionths, ending FROM stretches WHERE recording = {} AND {}{}"
+                       " AND (device, epoch, session) IN ({}) ORDER BY began_us LIMIT 1 BY device, epoch, id",
+                       question_.history.isRecording ? 1 : 0, touching(false),
+                       matching("audio_device", question_.history.devices), sessions);
+}
+
+std::string FleetQueries::sessions(const std::string& sessions)
+{
+    return fmt::format("SELECT device, epoch, toString(id), application, service, process, began, ended FROM sessions"
+                       " WHERE (device, epoch, id) IN ({}) ORDER BY has_ended DESC LIMIT 1 BY device, epoch, id",
+                       sessions);
+}
+
+std::string FleetQueries::faultsOf(const std::string& sessions) const
+{
+    return fmt::format("SELECT unit, epoch, toString(session), happened, kind, device, late FROM ({})"
+                       " WHERE (unit, epoch, session) IN ({}) ORDER BY happened",
+                       faults(true), sessions);
+}
