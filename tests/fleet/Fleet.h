@@ -29,7 +29,9 @@ inline const std::string forger = "forger"; // of no device
 
 // What the trial measures on its way.
 struct Figures {
-    std::uint64_t rowsOfWeeks = 0; // that the next were measured with
+    double secondsOfSending = 0; // until the stream had the batches of all devices
+    std::uint64_t batches = 0; // that it had then
+    std::uint64_t rowsOfWeeks = 0; // in these
     double secondsOfIngest = 0;
     std::uint64_t bytesOfBatches = 0; // as they left the devices
     std::uint64_t bytesInStream = 0; // as one server of the broker keeps them

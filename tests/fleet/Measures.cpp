@@ -39,12 +39,16 @@ double trueTime()
 void measureIngest(Fleet& fleet)
 {
     Figures& figures = fleet.figures;
+    auto begin = std::chrono::steady_clock::now();
     fleet.withDevices(fleet.devices.size(), [](Device& device) {
         while (!device.isAllSent())
             static_cast<void>(device.round(std::chrono::milliseconds(0)));
     });
-    figures.bytesInStream = fleet.broker.stream().bytes;
-    const auto begin = std::chrono::steady_clock::now();
+    figures.secondsOfSending = secondsSince(begin);
+    const StreamState waiting = fleet.broker.stream();
+    figures.batches = waiting.messages;
+    figures.bytesInStream = waiting.bytes;
+    begin = std::chrono::steady_clock::now();
     fleet.startIngests();
     waitUntil("the ingest has emptied the stream", [&] {
         for (const auto& copy : fleet.ingests)
@@ -101,6 +105,7 @@ std::string textOf(const Figures& figures)
 {
     const auto weeks = static_cast<double>(figures.rowsOfWeeks);
     return fmt::format(
+        "batches sent in a second            {:10.0f}  ({} in {:.1f} s, each over a connection of its own)\n"
         "rows stored in a second             {:10.0f}  ({} rows in {:.1f} s, all copies of kesto-ingest together)\n"
         "bytes of a row on its way           {:10.1f}  (compressed batches)\n"
         "bytes of a row in the stream        {:10.1f}  (on each server of the broker)\n"
@@ -109,6 +114,7 @@ std::string textOf(const Figures& figures)
         "                                    {:10.1f}  us for a row of a long store ({} rows)\n"
         "peak memory of kesto-uplink         {:10.1f}  MB, of which its own: {:.1f} MB\n"
         "peak memory of kesto-ingest         {:10.1f}  MB\n",
+        static_cast<double>(figures.batches) / figures.secondsOfSending, figures.batches, figures.secondsOfSending,
         weeks / figures.secondsOfIngest, figures.rowsOfWeeks, figures.secondsOfIngest,
         static_cast<double>(figures.bytesOfBatches) / weeks, static_cast<double>(figures.bytesInStream) / weeks,
         figures.bytesOfRow, figures.secondsOfRound * 1e3,

@@ -3,110 +3,19 @@
 //
 // Each test ends with the equation that counts: each row that a device may send is in the database, once by its key.
 #include "kesto-ingest/stream/JetStream.h"
+#include "support/Relay.h"
 #include "tools/kesto-ingest/Batches.h"
 #include "tools/kesto-ingest/FleetServers.h"
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
-#include <arpa/inet.h>
-#include <netinet/in.h>
-#include <poll.h>
-#include <sys/socket.h>
-
-#include <array>
-#include <atomic>
 #include <csignal>
-#include <thread>
 
 namespace kesto_ingest {
 namespace {
 
 using testing::HasSubstr;
-
-// Stands between the program and the database, and can keep the database's answers to itself.
-class Relay {
-public:
-    explicit Relay(std::uint16_t upstream) : upstream_(upstream)
-    {
-        sockaddr_in address = addressOf(0);
-        socklen_t size = sizeof address;
-        EXPECT_EQ(::bind(listener_.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address), 0);
-        EXPECT_EQ(::getsockname(listener_.get(), reinterpret_cast<sockaddr*>(&address), &size), 0);
-        port_ = ntohs(address.sin_port);
-        EXPECT_EQ(::listen(listener_.get(), 8), 0);
-        thread_ = std::thread([this] { run(); });
-    }
-    ~Relay()
-    {
-        shallEnd_ = true;
-        thread_.join();
-    }
-    Relay(const Relay&) = delete;
-    Relay& operator=(const Relay&) = delete;
-
-    [[nodiscard]] std::string address() const { return "http://127.0.0.1:" + std::to_string(port_); }
-    void keepAnswers() { keepsAnswers_ = true; }
-    [[nodiscard]] bool hasKeptAnAnswer() const { return hasKept_; }
-
-private:
-    using Descriptor = platform::FileDescriptor;
-
-    static sockaddr_in addressOf(std::uint16_t port)
-    {
-        sockaddr_in address{};
-        address.sin_family = AF_INET;
-        address.sin_port = htons(port);
-        address.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
-        return address;
-    }
-    static Descriptor makeSocket() { return Descriptor(::socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0)); }
-
-    // One connection at a time: the program has one.
-    void run()
-    {
-        while (!shallEnd_) {
-            pollfd awaited{listener_.get(), POLLIN, 0};
-            if (::poll(&awaited, 1, step) != 1)
-                continue;
-            const Descriptor client(::accept(listener_.get(), nullptr, nullptr));
-            const Descriptor server = makeSocket();
-            const sockaddr_in address = addressOf(upstream_);
-            if (::connect(server.get(), reinterpret_cast<const sockaddr*>(&address), sizeof address) == 0)
-                relay(client.get(), server.get());
-        }
-    }
-    void relay(int client, int server)
-    {
-        std::array<char, 65536> bytes;
-        while (!shallEnd_) {
-            std::array<pollfd, 2> awaited{{{client, POLLIN, 0}, {server, POLLIN, 0}}};
-            ::poll(awaited.data(), awaited.size(), step);
-            for (const bool isAnswer : {false, true}) {
-                if (awaited[isAnswer ? 1 : 0].revents == 0)
-                    continue;
-                const ssize_t count = ::recv(isAnswer ? server : client, bytes.data(), bytes.size(), 0);
-                if (count <= 0)
-                    return;
-                if (isAnswer && keepsAnswers_)
-                    hasKept_ = true;
-                else
-                    static_cast<void>(::send(isAnswer ? client : server, bytes.data(), static_cast<std::size_t>(count),
-                                             MSG_NOSIGNAL));
-            }
-        }
-    }
-
-    static constexpr int step = 20; // milliseconds
-
-    const std::uint16_t upstream_;
-    std::uint16_t port_ = 0;
-    const Descriptor listener_ = makeSocket();
-    std::atomic<bool> keepsAnswers_ = false;
-    std::atomic<bool> hasKept_ = false;
-    std::atomic<bool> shallEnd_ = false;
-    std::thread thread_;
-};
 
 class IngestEndToEnd : public testing::Test {
 protected:
@@ -258,11 +167,11 @@ protected:
 
 TEST_F(IngestKilled, LosesNothingIfItIsKilledBetweenInsertAndAcknowledgement)
 {
-    Relay relay(database.port());
-    auto ingest = start(relay.address());
-    relay.keepAnswers();
+    support::Relay way(database.port());
+    auto ingest = start(fmt::format("http://127.0.0.1:{}", way.port()));
+    way.loseAnswersWith("");
     send(*device1, "device-1", deviceLine(1, 2) + eventLine(1) + eventLine(2), "1");
-    waitUntil("the database has answered", [&] { return relay.hasKeptAnAnswer(); });
+    waitUntil("the database has answered", [&] { return way.hasLostAnAnswer(); });
     EXPECT_EQ(database.select("SELECT count() FROM events"), "2") << "inserted, and not acknowledged";
     ingest->signal(SIGKILL);
     EXPECT_EQ(ingest->wait(), 128 + SIGKILL);

@@ -34,7 +34,7 @@ using OwnedSubscription = Owned<natsSubscription, natsSubscription_Destroy>;
 using OwnedMessage = Owned<natsMsg, natsMsg_Destroy>;
 
 constexpr std::int64_t nanosecondsASecond = 1'000'000'000;
-constexpr std::int64_t giveBackAfter = 2000; // milliseconds
+constexpr std::int64_t giveBackAfter = 2 * nanosecondsASecond;
 constexpr std::int64_t rememberIdsFor = 120 * nanosecondsASecond;
 constexpr std::int64_t keepDeadFor = 90 * 86400 * nanosecondsASecond;
 constexpr std::int64_t mostUnacknowledged = 20'000;
@@ -296,19 +296,27 @@ std::expected<std::vector<Delivery>, std::string> JetStream::fetch(std::size_t m
     return deliveries;
 }
 
+// libnats' own functions for these need the subscription by which the batch came, which may be gone by now.
+void JetStream::tell(const Delivery& delivery, const std::string& word)
+{
+    auto* const message = static_cast<natsMsg*>(delivery.message.get());
+    static_cast<void>(
+        natsConnection_PublishString(connection_->connection.get(), natsMsg_GetReply(message), word.c_str()));
+}
+
 void JetStream::acknowledge(const Delivery& delivery)
 {
-    static_cast<void>(natsMsg_Ack(static_cast<natsMsg*>(delivery.message.get()), nullptr));
+    tell(delivery, "+ACK");
 }
 
 void JetStream::workGoesOn(const Delivery& delivery)
 {
-    static_cast<void>(natsMsg_InProgress(static_cast<natsMsg*>(delivery.message.get()), nullptr));
+    tell(delivery, "+WPI");
 }
 
 void JetStream::giveBack(const Delivery& delivery)
 {
-    static_cast<void>(natsMsg_NakWithDelay(static_cast<natsMsg*>(delivery.message.get()), giveBackAfter, nullptr));
+    tell(delivery, fmt::format(R"(-NAK {{"delay":{}}})", giveBackAfter));
 }
 
 std::expected<std::optional<Entry>, std::string> JetStream::last(const std::string& subject)

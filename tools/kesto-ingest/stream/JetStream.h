@@ -53,6 +53,7 @@ public:
 private:
     struct Connection;
 
+    void tell(const Delivery& delivery, const std::string& word);
     [[nodiscard]] std::expected<void, std::string> putSome(std::span<const Put> puts, std::span<PutAnswer> answers);
 
     std::unique_ptr<Connection> connection_;

@@ -25,6 +25,7 @@ public:
     virtual void send(const std::string& payload) = 0;
     virtual std::string lastLetter() = 0;
     virtual void end() = 0;
+    virtual void comeBack() = 0;
 };
 
 class FakeProvider : public StreamProvider {
@@ -33,6 +34,7 @@ public:
     void send(const std::string& payload) override { stream_.send("kesto.events.device-1", payload); }
     std::string lastLetter() override { return stream_.letters.back().payload; }
     void end() override { stream_.isAway = true; }
+    void comeBack() override { stream_.isAway = false; }
 
 private:
     FakeStream stream_;
@@ -52,6 +54,7 @@ public:
         return entry && *entry ? (*entry)->payload : "";
     }
     void end() override { server_.end(); }
+    void comeBack() override { server_.start(); }
 
     [[nodiscard]] JetStreamConfiguration as(const std::string& name) const
     {
@@ -94,6 +97,15 @@ protected:
             std::ranges::move(fetched.value_or(std::vector<Delivery>()), std::back_inserter(deliveries));
         }
         return deliveries;
+    }
+
+    // Whether a fetch succeeds, or fails, within a time: a connection's end, or its return, takes a moment.
+    [[nodiscard]] bool becomes(bool isUp)
+    {
+        for (int attempt = 0; attempt < 100; ++attempt)
+            if (stream.fetch(1, milliseconds{200}).has_value() == isUp)
+                return true;
+        return false;
     }
 
     std::unique_ptr<StreamProvider> provider = makeProvider(GetParam());
@@ -181,10 +193,25 @@ TEST_P(StreamContract, SaysThatItIsAway)
 {
     EXPECT_THAT(stream.fetch(1, milliseconds{50}).value(), SizeIs(0));
     provider->end();
-    bool isAway = false;
-    for (int attempt = 0; attempt < 50 && !isAway; ++attempt) // the connection's end takes a moment
-        isAway = !stream.fetch(1, milliseconds{200});
-    EXPECT_TRUE(isAway);
+    EXPECT_TRUE(becomes(false));
+}
+
+TEST_P(StreamContract, TakesWordOfABatchThatItGaveBeforeItWasAway)
+{
+    provider->send("one");
+    const auto before = fetch(1);
+    ASSERT_THAT(before, SizeIs(1));
+    provider->end();
+    EXPECT_TRUE(becomes(false));
+    stream.workGoesOn(before[0]);
+    provider->comeBack();
+    EXPECT_TRUE(becomes(true));
+    stream.giveBack(before[0]);
+    const auto again = fetch(1);
+    ASSERT_THAT(again, SizeIs(1));
+    EXPECT_EQ(again[0].payload, "one");
+    EXPECT_TRUE(again[0].isRepeated);
+    stream.acknowledge(before[0]);
 }
 
 TEST(JetStreamSetUp, MayBeRepeatedWithOtherSizesOnAFullServer)
