@@ -148,7 +148,8 @@ std::expected<std::uint64_t, std::string> ClickHouseServers::edition()
 {
     constexpr int unknownTable = 60;
     constexpr int unknownDatabase = 81;
-    Answer answer = ask("SELECT max(edition) FROM edition FORMAT TabSeparated", "", [](const Answer&) { return false; });
+    Answer answer =
+        ask("SELECT max(edition) FROM edition FORMAT TabSeparated", "", [](const Answer&) { return false; });
     if (const int code = exceptionCode(answer.text);
         !answer.isGood() && (code == unknownTable || code == unknownDatabase))
         return 0;
