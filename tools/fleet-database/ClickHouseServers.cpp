@@ -9,6 +9,7 @@
 #include <array>
 #include <charconv>
 #include <stdexcept>
+#include <system_error>
 #include <utility>
 
 namespace fleet_database {
@@ -156,7 +157,9 @@ std::expected<std::uint64_t, std::string> ClickHouseServers::edition()
     if (!answer.isGood())
         return std::unexpected(std::move(answer.text));
     std::uint64_t number = 0;
-    std::from_chars(answer.text.data(), answer.text.data() + answer.text.size(), number);
+    if (std::from_chars(answer.text.data(), answer.text.data() + answer.text.size(), number).ec != std::errc())
+        return std::unexpected(fmt::format("{} answers as ClickHouse does not: {}", configuration_.servers[current_],
+                                           firstLine(answer.text)));
     return number;
 }
 

@@ -122,7 +122,7 @@ FleetQueries::FleetQueries(FleetQuestion question, const std::vector<std::int64_
 {
 }
 
-// The rows of this second count.
+// Rows of this second count.
 std::string FleetQueries::present()
 {
     return "SELECT toUInt32(now()) + 1";
@@ -164,7 +164,8 @@ std::string matching(std::string_view column, const std::string& glob)
 
 // --- Faults
 
-// Those of an application that is asked for; `withDirection` leaves out those whose session did only the other.
+// Those of the applications that are asked for, and of sessions that did what is asked for. To know the device takes
+// longer; without it, faults of all devices come.
 std::string FleetQueries::faults(bool withDevices) const
 {
     const HistoryQuestion& asked = question_.history;
@@ -185,7 +186,7 @@ std::string FleetQueries::faults(bool withDevices) const
         storeHash, asked.isRecording ? 1 : 0, touching(true), storeHash, sessionsWithFault(true));
     return fmt::format(
         "SELECT * FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late,"
-        " greatest(arrayCount(x -> x.1 <= happened, own), 1) + 0 * happened AS place,"
+        " greatest(arrayCount(x -> x.1 <= happened, own), 1) + 0 * happened AS place," // a lambda's column is forgotten
         " if(named = '' AND session != 0, arrayMap(x -> x.3, own)[place], named) AS device,"
         " if(session != 0, arrayMap(x -> x.4, own)[place], '') AS format"
         " FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late, named, own"
@@ -349,7 +350,8 @@ std::string isAboveFloor()
 
 } // namespace
 
-// By store first: its numbers say what is the same, without their epoch.
+// By store first: its numbers say what is the same, without their epoch. Their lower half is enough to find what is
+// there twice: what only seems so is chosen once, too.
 std::string FleetQueries::all() const
 {
     const std::string floor = isAboveFloor();
@@ -363,7 +365,7 @@ std::string FleetQueries::all() const
         " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS without1,"
         " sum(toInt64(round(us * (greatest(v, 0) / 1000000)))) AS volume1, sum(f) AS faults1,"
         " uniqExactIf(n, f = 0) AS sessions1, uniqExactIf(n, gone) AS vanished1, countIf(f = 0) AS rows1,"
-        " uniqExactIf(r, f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
+        " uniqExactIf(toUInt32(r), f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
         distribution("played", "sessions > 0"), floor, distribution(faultsAnHour, floor), mostNamed + 1, faultsAnHour,
         floor, rows("", false));
 }

@@ -148,8 +148,8 @@ private:
                             configuration_.user.empty() ? "default" : configuration_.user, text));
         case 0:
             return std::runtime_error(
-                fmt::format("the database of the fleet cannot be asked: {}. --time-limit gives it more time than {} s",
-                            text, configuration_.timeLimit.count()));
+                fmt::format("the database of the fleet cannot be asked: {}{}", text,
+                            text.contains("timed out") ? ". --time-limit gives it more time" : ""));
         default: return std::runtime_error("the database of the fleet refuses a question: " + text);
         }
     }

@@ -1,6 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // What the report of a fleet adds to that of a device: models, releases and distributions over units; and what it does
 // with rows that come twice, with names that are made to harm, and with a database that it cannot ask.
+#include "kesto-ingest/MetricsServer.h"
 #include "kesto/report/fleet/FleetQueries.h"
 #include "kesto/store/EventDatabase.h"
 #include "tools/kesto/report/fleet/Fleet.h"
@@ -252,6 +253,16 @@ TEST_F(FleetReports, SayWhyTheDatabaseCannotBeAsked)
     EXPECT_THAT(failure({}), HasSubstr("the database of the fleet refuses a question: "));
     server.end();
     EXPECT_THAT(failure({}), HasSubstr("the database of the fleet cannot be asked: http://127.0.0.1:"));
+}
+
+TEST_F(FleetReports, DoNotTakeAnotherProgramForTheDatabase)
+{
+    const kesto_ingest::Metrics metrics;
+    const kesto_ingest::MetricsServer other(metrics, 0);
+    const Finished finished = tool.run({"report", "--fleet", fmt::format("http://127.0.0.1:{}", other.port())});
+    EXPECT_EQ(finished.status, 1);
+    EXPECT_EQ(finished.output, "");
+    EXPECT_THAT(finished.errors, HasSubstr("the database of the fleet cannot be asked: http://127.0.0.1:"));
 }
 
 TEST_F(FleetReports, AreAskedForByARightCommandLine)
