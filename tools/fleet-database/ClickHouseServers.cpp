@@ -9,6 +9,7 @@
 #include <array>
 #include <charconv>
 #include <stdexcept>
+#include <system_error>
 #include <utility>
 
 namespace fleet_database {
@@ -137,14 +138,17 @@ std::expected<std::uint64_t, std::string> ClickHouseServers::edition()
 {
     constexpr int unknownTable = 60;
     constexpr int unknownDatabase = 81;
-    Answer answer = ask("SELECT max(edition) FROM edition FORMAT TabSeparated", "", [](const Answer&) { return false; });
+    Answer answer =
+        ask("SELECT max(edition) FROM edition FORMAT TabSeparated", "", [](const Answer&) { return false; });
     if (const int code = exceptionCode(answer.text);
         !answer.isGood() && (code == unknownTable || code == unknownDatabase))
         return 0;
     if (!answer.isGood())
         return std::unexpected(std::move(answer.text));
     std::uint64_t number = 0;
-    std::from_chars(answer.text.data(), answer.text.data() + answer.text.size(), number);
+    if (std::from_chars(answer.text.data(), answer.text.data() + answer.text.size(), number).ec != std::errc())
+        return std::unexpected(fmt::format("{} answers as ClickHouse does not: {}", configuration_.servers[current_],
+                                           firstLine(answer.text)));
     return number;
 }
 

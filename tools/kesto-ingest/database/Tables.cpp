@@ -110,14 +110,18 @@ constexpr Column sessionColumns[] = {
     received,
 };
 
-// A stretch of more than a day is apart: who looks for those that began before a moment and went on reads one day before
-// it, and these few.
+// A stretch of more than a day is apart: who looks for those that began before a moment and went on reads one day
+// before it, and these few.
 constexpr TableDefinition tables[] = {
-    {"batches", "what each device has sent", "toMonday(toDateTime(toUInt32(sent)))", "device, epoch, last_id, first_id", "", batchColumns},
-    {"events", "what messages told", "toMonday(toDateTime(intDiv(happened_us, 1000000)))", "device, epoch, id", "", eventColumns},
+    {"batches", "what each device has sent", "toMonday(toDateTime(toUInt32(sent)))", "device, epoch, last_id, first_id",
+     "", batchColumns},
+    {"events", "what messages told", "toMonday(toDateTime(intDiv(happened_us, 1000000)))", "device, epoch, id", "",
+     eventColumns},
     {"stretches", "who played or recorded for how long",
-     "(toMonday(toDateTime(intDiv(began_us, 1000000))), microseconds > 86400000000)", "device, epoch, id", "", stretchColumns},
-    {"sessions", "of the devices' clients", "toMonday(toDateTime(toUInt32(began)))", "device, epoch, id", "has_ended", sessionColumns},
+     "(toMonday(toDateTime(intDiv(began_us, 1000000))), microseconds > 86400000000)", "device, epoch, id", "",
+     stretchColumns},
+    {"sessions", "of the devices' clients", "toMonday(toDateTime(toUInt32(began)))", "device, epoch, id", "has_ended",
+     sessionColumns},
 };
 
 std::string columnsText(const TableDefinition& table)
@@ -145,9 +149,8 @@ std::string tableText(const TableDefinition& table, std::string_view database, s
         arguments += fmt::format("{}{}", isPlain ? "" : ", ", table.winner);
     std::string text = fmt::format("-- {}\nCREATE TABLE IF NOT EXISTS {}.{}{}{} (\n{})", table.meaning, database,
                                    table.name, isPlain ? "" : "_local", onCluster, columnsText(table));
-    text += fmt::format(
-        " ENGINE = {}ReplacingMergeTree({})\nPARTITION BY {}\nORDER BY ({});\n\n",
-        isPlain ? "" : "Replicated", arguments, table.partition, table.order);
+    text += fmt::format(" ENGINE = {}ReplacingMergeTree({})\nPARTITION BY {}\nORDER BY ({});\n\n",
+                        isPlain ? "" : "Replicated", arguments, table.partition, table.order);
     if (!isPlain)
         text += fmt::format("CREATE TABLE IF NOT EXISTS {0}.{1}{2} AS {0}.{1}_local\n"
                             "ENGINE = Distributed({3}, {0}, {1}_local, cityHash64(device));\n\n",

@@ -46,6 +46,8 @@ using Index = std::size_t;
 using Microseconds = std::int64_t; // since 1970 UTC, or a length
 using Millionths = std::int64_t; // of the slider
 
+constexpr double far = 4e12; // seconds, from any calendar
+
 // The part of a stretch that lies in a span of time.
 struct Piece {
     std::int64_t session = 0;
@@ -173,8 +175,6 @@ public:
     }
 
 private:
-    static constexpr double far = 4e12; // seconds
-
     // What counts, and in which lines.
     struct CountedPiece {
         Piece piece;

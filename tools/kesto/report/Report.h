@@ -29,8 +29,8 @@ struct Played {
     [[nodiscard]] std::optional<double> faultsAnHour() const;
 };
 
-// The same in whole numbers, whose sums are the same in any order: the database of a fleet adds in another one. Shares of
-// the volume are rounded for each part of a stretch that counts on its own.
+// The same in whole numbers, whose sums are the same in any order: the database of a fleet adds in another one. Shares
+// of the volume are rounded for each part of a stretch that counts on its own.
 struct PlayedSum {
     std::int64_t microseconds = 0;
     std::int64_t muted = 0;

@@ -187,14 +187,14 @@ std::string timeZoneName(bool isUTC)
 
 void writePage(const Report& report, const ReportOptions& options)
 {
-    const std::string page =
-        reportPage(report,
-                   {.host = options.isOfFleet() ? "fleet " + options.fleet.database.database : hostName(),
-                    .database = options.isOfFleet() ? options.fleet.database.servers.front() : options.database.string(),
-                    .made = present(),
-                    .timeZone = timeZoneName(options.isUTC)
-                        + (options.dayStarts ? ", each from " + *options.dayStarts : std::string()),
-                    .isUTC = options.isUTC});
+    const std::string page = reportPage(
+        report,
+        {.host = options.isOfFleet() ? "fleet " + options.fleet.database.database : hostName(),
+         .database = options.isOfFleet() ? options.fleet.database.servers.front() : options.database.string(),
+         .made = present(),
+         .timeZone =
+             timeZoneName(options.isUTC) + (options.dayStarts ? ", each from " + *options.dayStarts : std::string()),
+         .isUTC = options.isUTC});
     if (*options.page == "-")
         fmt::print("{}", page);
     else

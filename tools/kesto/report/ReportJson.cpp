@@ -120,8 +120,8 @@ std::string reportJson(const Report& report)
         {"days",
          listOf(report.days,
                 [](const ReportDay& day) {
-                    return withFigures({{"day", dateText(day.date)}, {"from", day.span.from}, {"until", day.span.until}},
-                                       day.played);
+                    return withFigures(
+                        {{"day", dateText(day.date)}, {"from", day.span.from}, {"until", day.span.until}}, day.played);
                 })},
         {"applications", lines(report, ReportBy::Application)},
         {"devices", lines(report, ReportBy::Device)},

@@ -16,7 +16,8 @@ enum class ReportBy : std::uint8_t { Day, Application, Device, Volume, Format, F
 // The words of the command line, and the first columns of CSV.
 [[nodiscard]] std::string_view name(ReportBy by);
 
-// The lines of a table of applications, devices, formats or kinds of fault; of a fleet also of models, releases or units.
+// The lines of a table of applications, devices, formats or kinds of fault; of a fleet also of models, releases or
+// units.
 [[nodiscard]] const std::vector<ReportLine>& linesOf(const Report& report, ReportBy by);
 
 // The time at a step of the slider.

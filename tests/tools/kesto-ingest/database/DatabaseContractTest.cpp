@@ -108,11 +108,12 @@ TEST(ClickHouseTables, HoldWhatRowsTell)
         R"("0123456789abcdef0123456789abcdef","00000000000000000000000000000001",3,1795264505.66,\N,)"
         R"("com.quarn.kesto.Error.IssueDetector",7,"player","lamp","1.2",)"
         R"("{""active_devices"":""café"",""late_cycles"":3}","café",3,1795264505660000)");
-    EXPECT_EQ(server.select(
-                  "SELECT id, recording, began, seconds, played_seconds, session, application, audio_device, format, "
-                  "channels, volume, ending, model, began_us, microseconds, volume_millionths FROM stretches FORMAT CSV"),
-              R"(4,0,1795264500.25,12.5,12.5,7,"player","headset","",2,0.5,"stopped","lamp",)"
-              "1795264500250000,12500000,500000");
+    EXPECT_EQ(
+        server.select(
+            "SELECT id, recording, began, seconds, played_seconds, session, application, audio_device, format, "
+            "channels, volume, ending, model, began_us, microseconds, volume_millionths FROM stretches FORMAT CSV"),
+        R"(4,0,1795264500.25,12.5,12.5,7,"player","headset","",2,0.5,"stopped","lamp",)"
+        "1795264500250000,12500000,500000");
     EXPECT_EQ(server.select("SELECT id, reporter, began, ended, application FROM sessions FINAL FORMAT CSV"),
               R"(7,-5,1795264400,1795264600.125,"player")");
     EXPECT_EQ(server.select("SELECT first_id, last_id, sent, model, version FROM batches FORMAT CSV"),
@@ -125,12 +126,14 @@ TEST(ClickHouseTables, HoldWhatRowsTell)
     EXPECT_EQ(provider.database().insert("stretches", batch->rows[2].json), InsertAnswer());
     EXPECT_EQ(server.select("SELECT count() FROM stretches FINAL"), "1");
     for (const std::string_view time : {"0", "500000", "86400000000", "4294967295000000"})
-        EXPECT_EQ(provider.database().insert(
-                      "events",
-                      fmt::format(R"({{"device":"{}","epoch":"{}","id":99,"happened_us":{},"time":0,"name":"n","payload":"{{}}"}})"
-                                  "\n",
-                                  deviceA, epochA, time)),
-                  InsertAnswer());
+        EXPECT_EQ(
+            provider.database().insert(
+                "events",
+                fmt::format(
+                    R"({{"device":"{}","epoch":"{}","id":99,"happened_us":{},"time":0,"name":"n","payload":"{{}}"}})"
+                    "\n",
+                    deviceA, epochA, time)),
+            InsertAnswer());
 
     // Columns that the tables do not have are not the rows' fault.
     EXPECT_EQ(provider.database().insert("events", "{\"colour\":1}\n").outcome, InsertOutcome::Unavailable);

@@ -69,7 +69,8 @@ std::vector<std::string> textOf(const std::vector<ReportLine>& lines)
 {
     std::vector<std::string> texts;
     for (const ReportLine& line : lines)
-        texts.push_back(fmt::format("{} {} {} {}", line.key, line.played.seconds, line.played.sessions, line.played.faults));
+        texts.push_back(
+            fmt::format("{} {} {} {}", line.key, line.played.seconds, line.played.sessions, line.played.faults));
     return texts;
 }
 

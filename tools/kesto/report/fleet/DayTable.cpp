@@ -2,7 +2,6 @@
 // How late days begin changes twice a year, so that a table of these changes is short, however long the span is.
 #include "kesto/report/fleet/DayTable.h"
 
-#include <cstdlib>
 #include <fmt/format.h>
 
 namespace {
@@ -19,18 +18,15 @@ DayTable::DayTable(const std::vector<std::int64_t>& days)
         const std::int64_t late = days[static_cast<std::size_t>(day)] - first_ - day * microsecondsADay;
         if (late != (late_.empty() ? 0 : late_.back().second))
             late_.emplace_back(day, late);
-        isFar_ |= std::abs(late) >= microsecondsADay;
     }
 }
 
 std::string DayTable::of(std::string_view moment, std::string_view name) const
 {
-    std::string day = fmt::format("intDiv({} - {}, {})", moment, first_, microsecondsADay);
-    for (int time = 0; time < (isFar_ ? 2 : 1); ++time) {
-        const std::string guess = fmt::format("{}_{}", name, time);
-        day = fmt::format("({} AS {}) + ({} >= {}) - ({} < {})", day, guess, moment,
-                          beginning(fmt::format("({} + 1)", guess)), moment, beginning(guess));
-    }
+    const std::string guess = fmt::format("{}_guess", name);
+    const std::string day =
+        fmt::format("(intDiv({0} - {1}, {2}) AS {3}) + ({0} >= {4}) - ({0} < {5})", moment, first_, microsecondsADay,
+                    guess, beginning(fmt::format("({} + 1)", guess)), beginning(guess));
     return fmt::format("toInt64(least(greatest({}, 0), {})) AS {}", day, last_, name);
 }
 

@@ -1,8 +1,8 @@
 // SPDX-License-Identifier: Apache-2.0
 // Days as expressions of SQL. Where days begin is known here, by the reader's clock, and not in the database.
 //
-// Most days have 24 hours. So a day is looked for where it would be then, and is at most one beside it; where a country
-// has skipped one, two.
+// Most days have 24 hours. So a day is looked for where it would be if all had, and is at most one beside it: clocks
+// are set by some hours, and a day that a country skips takes no time.
 #pragma once
 
 #include <cstdint>
@@ -26,5 +26,4 @@ private:
     std::int64_t first_; // when the first day would begin
     std::int64_t last_; // the number of the last day
     std::vector<std::pair<std::int64_t, std::int64_t>> late_; // from which day on, by how much
-    bool isFar_ = false; // by a day or more
 };

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
-// Names of columns within a query: u is the hash of the unit, s of its session, i of its row, k the key; n and r are the
-// numbers of session and row in the device's store. us is how long in microseconds, v the volume in millionths or -1, and
-// f is 1 of a fault. Sums are of whole numbers.
+// Names of columns within a query: u is the hash of the unit, s of its session, i of its row, k the key; n and r are
+// the numbers of session and row in the device's store. us is how long in microseconds, v the volume in millionths or
+// -1, and f is 1 of a fault. Sums are of whole numbers.
 //
 // A subquery of a distributed table in another's condition is GLOBAL: the first server asks it once for all.
 #include "kesto/report/fleet/FleetQueries.h"
@@ -122,7 +122,7 @@ FleetQueries::FleetQueries(FleetQuestion question, const std::vector<std::int64_
 {
 }
 
-// The rows of this second count.
+// Rows of this second count.
 std::string FleetQueries::present()
 {
     return "SELECT toUInt32(now()) + 1";
@@ -164,18 +164,19 @@ std::string matching(std::string_view column, const std::string& glob)
 
 // --- Faults
 
-// Those of an application that is asked for; `withDirection` leaves out those whose session did only the other.
+// Those of the applications that are asked for, and of sessions that did what is asked for. To know the device takes
+// longer; without it, faults of all devices come.
 std::string FleetQueries::faults(bool withDevices) const
 {
     const HistoryQuestion& asked = question_.history;
-    std::string each = fmt::format(
-        "SELECT {} AS u, {} AS st, {} AS s, device AS unit, epoch, session, happened_us AS happened,"
-        " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
-        " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM events"
-        " WHERE name LIKE 'com.quarn.kesto.Error.%' AND happened_us >= {} AND happened_us < {}"
-        " AND received < toDateTime({}){}{}{} LIMIT 1 BY device, epoch, id",
-        unitHash, storeHash, sessionHash, std::string_view("com.quarn.kesto.Error.").size() + 1, from_, until_, present_,
-        unitCondition(), matching("application", asked.applications), direction_);
+    std::string each =
+        fmt::format("SELECT {} AS u, {} AS st, {} AS s, device AS unit, epoch, session, happened_us AS happened,"
+                    " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
+                    " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM events"
+                    " WHERE name LIKE 'com.quarn.kesto.Error.%' AND happened_us >= {} AND happened_us < {}"
+                    " AND received < toDateTime({}){}{}{} LIMIT 1 BY device, epoch, id",
+                    unitHash, storeHash, sessionHash, std::string_view("com.quarn.kesto.Error.").size() + 1, from_,
+                    until_, present_, unitCondition(), matching("application", asked.applications), direction_);
     if (!withDevices)
         return each;
     // A fault without a device is on that on which its session played then; in between, before it.
@@ -185,7 +186,7 @@ std::string FleetQueries::faults(bool withDevices) const
         storeHash, asked.isRecording ? 1 : 0, touching(true), storeHash, sessionsWithFault(true));
     return fmt::format(
         "SELECT * FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late,"
-        " greatest(arrayCount(x -> x.1 <= happened, own), 1) + 0 * happened AS place,"
+        " greatest(arrayCount(x -> x.1 <= happened, own), 1) + 0 * happened AS place," // a lambda's column is forgotten
         " if(named = '' AND session != 0, arrayMap(x -> x.3, own)[place], named) AS device,"
         " if(session != 0, arrayMap(x -> x.4, own)[place], '') AS format"
         " FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late, named, own"
@@ -207,11 +208,23 @@ std::string FleetQueries::recordings() const
                        storeHash, touching(true), sessionsWithFault(false), mostNamed + 1);
 }
 
-std::string FleetQueries::onlyRecordings(const std::string& sessions) const
+std::string FleetQueries::listOf(const std::vector<FleetSession>& recordings) const
 {
-    return fmt::format("SELECT {} AS st, session FROM stretches WHERE {} AND (st, session) GLOBAL IN ({})"
-                       " GROUP BY st, session HAVING min(recording) = 1",
-                       storeHash, touching(true), sessions);
+    if (recordings.size() > mostNamed)
+        return fmt::format("SELECT {} AS st, session FROM stretches WHERE recording = 1 AND {}", storeHash,
+                           touching(true));
+    std::string list;
+    for (const FleetSession& each : recordings)
+        list += fmt::format("{}({},{})", list.empty() ? "" : ",", each.store, each.session);
+    return list;
+}
+
+std::string FleetQueries::onlyRecordings(const std::vector<FleetSession>& recordings) const
+{
+    return fmt::format(
+        "SELECT toString({} AS st), toString(session) FROM stretches WHERE {} AND (st, session) GLOBAL IN"
+        " ({}) AND (st, session) GLOBAL IN ({}) GROUP BY st, session HAVING min(recording) = 1 LIMIT {}",
+        storeHash, touching(true), listOf(recordings), sessionsWithFault(false), mostNamed + 1);
 }
 
 void FleetQueries::setRecordings(const std::vector<FleetSession>& sessions)
@@ -220,14 +233,12 @@ void FleetQueries::setRecordings(const std::vector<FleetSession>& sessions)
     direction_ = isRecording ? " AND 0" : "";
     if (sessions.empty())
         return;
-    std::string list;
-    for (const FleetSession& each : sessions)
-        list += fmt::format("{}({},{})", list.empty() ? "" : ",", each.store, each.session);
-    if (sessions.size() > mostNamed)
-        list = fmt::format("SELECT {} AS st, session FROM stretches WHERE recording = 1 AND {}", storeHash,
-                           touching(true));
-    direction_ = fmt::format(" AND ({}, session) GLOBAL {} ({})", storeHash, isRecording ? "IN" : "NOT IN",
-                             isRecording ? list : onlyRecordings(list));
+    std::string list = listOf(sessions);
+    if (sessions.size() > mostNamed && !isRecording)
+        list = fmt::format("SELECT {} AS st, session FROM stretches WHERE {} AND (st, session) GLOBAL IN ({})"
+                           " GROUP BY st, session HAVING min(recording) = 1",
+                           storeHash, touching(true), list);
+    direction_ = fmt::format(" AND ({}, session) GLOBAL {} ({})", storeHash, isRecording ? "IN" : "NOT IN", list);
 }
 
 // --- Rows
@@ -286,10 +297,9 @@ std::string FleetQueries::daysOfStretches(const std::string& key, const std::str
 {
     const std::string both = fmt::format("{}, {}", days_.of("begins", "first"), days_.of("(ends - 1)", "last"));
     const std::string whole = fmt::format("{}, first AS day, ends - begins AS us, {} AS k", both, key);
-    const std::string parts =
-        fmt::format("{}, first + arrayJoin(range(toUInt64(last - first + 1))) AS day,"
-                    " least(ends, {}) - greatest(begins, {}) AS us, {} AS k",
-                    both, days_.beginning("(day + 1)"), days_.beginning("day"), key);
+    const std::string parts = fmt::format("{}, first + arrayJoin(range(toUInt64(last - first + 1))) AS day,"
+                                          " least(ends, {}) - greatest(begins, {}) AS us, {} AS k",
+                                          both, days_.beginning("(day + 1)"), days_.beginning("day"), key);
     return fmt::format("{} UNION ALL {}", onceEach(whole, condition + " AND first = last"),
                        onceEach(parts, condition + " AND first != last"));
 }
@@ -314,8 +324,8 @@ std::string FleetQueries::daysOf(std::string_view by, const std::vector<std::str
     std::string list;
     for (const std::string& key : keys)
         list += (list.empty() ? "" : ",") + sqlText(key);
-    const std::string ofStretches = daysOfStretches(fmt::format("concat(toString(day), ' ', {})", by),
-                                                    fmt::format(" AND {} IN ({})", by, list));
+    const std::string ofStretches =
+        daysOfStretches(fmt::format("concat(toString(day), ' ', {})", by), fmt::format(" AND {} IN ({})", by, list));
     const std::string ofFaults =
         faultRow(fmt::format("concat(toString({}), ' ', {})", days_.of("happened", "day"), ofFault(by)),
                  faults(needsDevices(by)));
@@ -340,7 +350,8 @@ std::string isAboveFloor()
 
 } // namespace
 
-// By store first: its numbers say what is the same, without their epoch.
+// By store first: its numbers say what is the same, without their epoch. Their lower half is enough to find what is
+// there twice: what only seems so is chosen once, too.
 std::string FleetQueries::all() const
 {
     const std::string floor = isAboveFloor();
@@ -354,7 +365,7 @@ std::string FleetQueries::all() const
         " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS without1,"
         " sum(toInt64(round(us * (greatest(v, 0) / 1000000)))) AS volume1, sum(f) AS faults1,"
         " uniqExactIf(n, f = 0) AS sessions1, uniqExactIf(n, gone) AS vanished1, countIf(f = 0) AS rows1,"
-        " uniqExactIf(r, f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
+        " uniqExactIf(toUInt32(r), f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
         distribution("played", "sessions > 0"), floor, distribution(faultsAnHour, floor), mostNamed + 1, faultsAnHour,
         floor, rows("", false));
 }
@@ -398,17 +409,17 @@ std::string FleetQueries::sessionsThatPlayedWithFaults() const
 
 std::string FleetQueries::units(const std::vector<std::string>& hashes) const
 {
-    const std::string chosen =
-        hashes.empty() ? "" : fmt::format(" AND {} IN ({})", unitHash, fmt::join(hashes, ","));
+    const std::string chosen = hashes.empty() ? "" : fmt::format(" AND {} IN ({})", unitHash, fmt::join(hashes, ","));
     const std::string ofFaults = fmt::format(
         "SELECT unit AS name, s, toInt64(0) AS us, toInt64(-1) AS v, toUInt64(1) AS f, model AS m, version AS r"
         " FROM ({})"
         " WHERE 1{}",
         faults(needsDevices("")), hashes.empty() ? "" : fmt::format(" AND u IN ({})", fmt::join(hashes, ",")));
     const std::string ofStretches = onceEach("ends - begins AS us, (device, model, version) AS k", chosen);
-    return fmt::format("SELECT name, any(m), any(r), {}, sum(f), uniqExactIf(s, f = 0) FROM (SELECT k.1 AS name, s, us, v,"
-                       " f, k.2 AS m, k.3 AS r FROM ({}) UNION ALL {}) GROUP BY name",
-                       figures, ofStretches, ofFaults);
+    return fmt::format(
+        "SELECT name, any(m), any(r), {}, sum(f), uniqExactIf(s, f = 0) FROM (SELECT k.1 AS name, s, us, v,"
+        " f, k.2 AS m, k.3 AS r FROM ({}) UNION ALL {}) GROUP BY name",
+        figures, ofStretches, ofFaults);
 }
 
 std::string FleetQueries::worstSessions() const
@@ -423,8 +434,8 @@ std::string FleetQueries::sessionList(const std::vector<std::vector<std::string>
 {
     std::string list;
     for (const auto& each : sessions)
-        list += fmt::format("{}({},{},{})", list.empty() ? "" : ",", sqlText(each.at(0)), sqlText(each.at(1)),
-                            each.at(2));
+        list +=
+            fmt::format("{}({},{},{})", list.empty() ? "" : ",", sqlText(each.at(0)), sqlText(each.at(1)), each.at(2));
     return list;
 }
 

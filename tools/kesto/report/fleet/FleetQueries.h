@@ -37,6 +37,10 @@ public:
     // store, session: of the sessions with faults that recorded. A fault does not say whether something was played or
     // recorded; its session does, by its stretches in the span and a day before it.
     [[nodiscard]] std::string recordings() const;
+    // store, session: of these, those that did not play.
+    [[nodiscard]] std::string onlyRecordings(const std::vector<FleetSession>& recordings) const;
+    // Those that recorded, in a report of recordings; in another, those that did not play. Without any, no fault is one
+    // of recording.
     void setRecordings(const std::vector<FleetSession>& sessions);
     void setDoubled(const std::vector<std::string>& units);
 
@@ -81,7 +85,7 @@ private:
     [[nodiscard]] std::string touching(bool isWide) const;
     [[nodiscard]] std::string unitCondition() const;
     [[nodiscard]] std::string sessionsWithFault(bool withDirection) const;
-    [[nodiscard]] std::string onlyRecordings(const std::string& sessions) const;
+    [[nodiscard]] std::string listOf(const std::vector<FleetSession>& recordings) const;
 
     FleetQuestion question_;
     DayTable days_;

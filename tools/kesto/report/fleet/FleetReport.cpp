@@ -96,7 +96,8 @@ private:
 class FleetDatabase {
 public:
     explicit FleetDatabase(const ClickHouseConfiguration& configuration)
-        : configuration_(configuration), servers_(configuration, longestAnswer)
+        : configuration_(configuration),
+          servers_(configuration, longestAnswer)
     {
         const auto edition = servers_.edition();
         if (!edition)
@@ -147,8 +148,8 @@ private:
                             configuration_.user.empty() ? "default" : configuration_.user, text));
         case 0:
             return std::runtime_error(
-                fmt::format("the database of the fleet cannot be asked: {}. --time-limit gives it more time than {} s",
-                            text, configuration_.timeLimit.count()));
+                fmt::format("the database of the fleet cannot be asked: {}{}", text,
+                            text.contains("timed out") ? ". --time-limit gives it more time" : ""));
         default: return std::runtime_error("the database of the fleet refuses a question: " + text);
         }
     }
@@ -183,8 +184,7 @@ std::vector<ReportLine> sorted(std::vector<SummedLine> lines)
     std::vector<ReportLine> finished;
     finished.reserve(lines.size());
     for (SummedLine& line : lines)
-        finished.push_back(
-            {.key = std::move(line.key), .played = line.sum.played(), .overUnits = line.overUnits});
+        finished.push_back({.key = std::move(line.key), .played = line.sum.played(), .overUnits = line.overUnits});
     return finished;
 }
 
@@ -211,11 +211,9 @@ public:
     {
         database_.ask(FleetQueries::present(),
                       [this](Cells& row) { queries_.setPresent(std::to_string(row.integer())); });
-        std::vector<FleetSession> recordings;
-        database_.ask(queries_.recordings(), [&](Cells& row) {
-            std::string store = row.text();
-            recordings.push_back({std::move(store), row.text()});
-        });
+        std::vector<FleetSession> recordings = readSessions(queries_.recordings());
+        if (!recordings.empty() && !report_.isRecording)
+            recordings = readSessions(queries_.onlyRecordings(recordings));
         queries_.setRecordings(recordings);
         std::vector<std::string> doubled = readAll();
         if (!doubled.empty()) {
@@ -235,6 +233,16 @@ public:
 
 private:
     FleetPart& fleet() { return *report_.fleet; }
+
+    std::vector<FleetSession> readSessions(const std::string& query)
+    {
+        std::vector<FleetSession> sessions;
+        database_.ask(query, [&](Cells& row) {
+            std::string store = row.text();
+            sessions.push_back({std::move(store), row.text()});
+        });
+        return sessions;
+    }
 
     // The units of which the database has rows twice: the figures are then wrong.
     std::vector<std::string> readAll()
@@ -339,13 +347,11 @@ private:
             day.byApplication.resize(std::min(report_.applications.size(), Report::mostInDays));
             day.byDevice.resize(std::min(report_.devices.size(), Report::mostInDays));
         }
-        readDaysOf(ReportBy::Application, report_.applications,
-                   [](ReportDay& day, std::size_t rank, const Played& played) {
-                       day.byApplication[rank] = played.seconds;
-                   });
-        readDaysOf(ReportBy::Device, report_.devices, [](ReportDay& day, std::size_t rank, const Played& played) {
-            day.byDevice[rank] = played;
-        });
+        readDaysOf(
+            ReportBy::Application, report_.applications,
+            [](ReportDay& day, std::size_t rank, const Played& played) { day.byApplication[rank] = played.seconds; });
+        readDaysOf(ReportBy::Device, report_.devices,
+                   [](ReportDay& day, std::size_t rank, const Played& played) { day.byDevice[rank] = played; });
     }
 
     void readVolumes()

@@ -32,8 +32,8 @@ std::string headOf(std::string_view first, std::string_view more, const PageWord
 
 std::string tableOf(std::string_view name, const std::vector<ReportLine>& lines, const PageWords& words)
 {
-    std::string html = headOf(name, "<th scope=col>Units", words)
-        + "<th scope=col>Median<th scope=col>90 %<th scope=col>Worst<tbody>";
+    std::string html =
+        headOf(name, "<th scope=col>Units", words) + "<th scope=col>Median<th scope=col>90 %<th scope=col>Worst<tbody>";
     for (std::size_t index = 0; index < std::min(lines.size(), mostLines); ++index) {
         const OverUnits of = lines[index].overUnits.value_or(OverUnits());
         html += fmt::format("<tr><th scope=row><bdi>{}</bdi><td>{}{}", htmlName(lines[index].key, longestLabel),
@@ -53,9 +53,9 @@ std::string worstOf(const std::vector<WorstUnit>& units, const PageWords& words)
     std::string html = "<section><h2>Worst units</h2><p class=sub>Those with most faults an hour</p>"
         + headOf("Unit", "<th scope=col>Model<th scope=col>Release", words) + "<tbody>";
     for (const WorstUnit& each : units)
-        html += fmt::format("<tr><th scope=row>{}<td><bdi>{}</bdi><td><bdi>{}</bdi>{}", htmlText(each.unit, longestName),
-                            htmlName(each.model, longestShortName), htmlName(each.version, longestShortName),
-                            figuresOf(each.played));
+        html += fmt::format("<tr><th scope=row>{}<td><bdi>{}</bdi><td><bdi>{}</bdi>{}",
+                            htmlText(each.unit, longestName), htmlName(each.model, longestShortName),
+                            htmlName(each.version, longestShortName), figuresOf(each.played));
     return html + "</table></div></section>";
 }
 
@@ -66,9 +66,9 @@ std::string fleetSection(const Report& report, const PageWords& words)
     if (!report.fleet || !report.fleet->hours)
         return {};
     const FleetPart& fleet = *report.fleet;
-    std::string html = fmt::format("<section><h2>{}</h2><p class=sub>Hours {} by a unit: {}",
-                                   countText(fleet.overUnits.units, "unit"), words.played(),
-                                   distributionText(*fleet.hours, " h"));
+    std::string html =
+        fmt::format("<section><h2>{}</h2><p class=sub>Hours {} by a unit: {}", countText(fleet.overUnits.units, "unit"),
+                    words.played(), distributionText(*fleet.hours, " h"));
     if (const auto& rates = fleet.overUnits.faultsAnHour)
         html += fmt::format("<p class=sub>Faults an hour of a unit: {}; of {} that {} an hour or more",
                             distributionText(*rates, ""), fleet.overUnits.compared, words.played());

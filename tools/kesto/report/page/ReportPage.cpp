@@ -81,8 +81,8 @@ std::string sections(const Report& report, const PageWords& words)
         return fmt::format("<section><h2>Nothing was {}</h2><p class=sub>The {} has nothing of this time.</p>"
                            "</section>",
                            words.played(), report.fleet ? "database" : "event store");
-    return timeSection(report, words) + fleetSection(report, words) + "<div class=two>" + deviceSection(report, words) + volumeSection(report, words)
-        + "</div>" + faultSection(report, words) + worstSection(report, words);
+    return timeSection(report, words) + fleetSection(report, words) + "<div class=two>" + deviceSection(report, words)
+        + volumeSection(report, words) + "</div>" + faultSection(report, words) + worstSection(report, words);
 }
 
 std::string footer(const Report& report, const PageHead& head, const PageWords& words)

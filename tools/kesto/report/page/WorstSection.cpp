@@ -192,8 +192,8 @@ std::string rowOf(const WorstSession& worst, const TimeSpan& span, const PageWor
         worst.unit.empty() ? "" : fmt::format("<br><span class=sub>{}</span>", htmlText(worst.unit, longestName));
     return fmt::format("<tr><th scope=row>{}{}<td class=l>{}<td class=l>{}<td class=l><bdi>{}</bdi><td>{}<td>{}<td>{}"
                        "<td>{}<td class=l>{}<td class=l>{}",
-                       worst.session.id, unit, dayAndTimeText(worst.session.began, span, words.isUTC), who(worst.session),
-                       htmlDevices(worst.devices, longestLabel), durationText(worst.played.seconds),
+                       worst.session.id, unit, dayAndTimeText(worst.session.began, span, words.isUTC),
+                       who(worst.session), htmlDevices(worst.devices, longestLabel), durationText(worst.played.seconds),
                        worst.played.faults, worst.lateCycles, rateText(worst.played.faultsAnHour()),
                        Timeline(worst, span, words).draw(), endOf(worst, span, words));
 }

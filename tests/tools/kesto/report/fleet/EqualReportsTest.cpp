@@ -73,7 +73,8 @@ protected:
         const Dictionary own = dictionaryOf(tool.print(ofDevice));
         EXPECT_GT(own.find("seconds")->asDouble(), 3600);
         arguments.insert(arguments.end(), {"--unit", unit});
-        EXPECT_EQ(differences("", own, dictionaryOf(print(arguments))), "") << fmt::format("{}", fmt::join(arguments, " "));
+        EXPECT_EQ(differences("", own, dictionaryOf(print(arguments))), "")
+            << fmt::format("{}", fmt::join(arguments, " "));
     }
 
     const ZoneDays& days = zonesWithDays()[GetParam()];

@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// A fleet of a test's own: a real database, filled by the code of kesto-uplink and kesto-ingest, and the tool that reads
-// it.
+// A fleet of a test's own: a real database, filled by the code of kesto-uplink and kesto-ingest, and the tool that
+// reads it.
 #pragma once
 
 #include "kesto-ingest/batch/Batch.h"

@@ -1,11 +1,13 @@
 // SPDX-License-Identifier: Apache-2.0
 // What the report of a fleet adds to that of a device: models, releases and distributions over units; and what it does
 // with rows that come twice, with names that are made to harm, and with a database that it cannot ask.
+#include "kesto-ingest/MetricsServer.h"
 #include "kesto/report/fleet/FleetQueries.h"
 #include "kesto/store/EventDatabase.h"
 #include "tools/kesto/report/fleet/Fleet.h"
 
 #include <fmt/format.h>
+#include <fmt/ranges.h>
 #include <gmock/gmock.h>
 
 namespace kesto_tool {
@@ -14,6 +16,7 @@ namespace {
 using foundation::Dictionary;
 using foundation::Value;
 using testing::HasSubstr;
+using testing::Not;
 
 const std::string unit1(32, '1');
 const std::string unit2(32, '2');
@@ -135,10 +138,11 @@ TEST_F(ThreeUnits, AreTablesForProgramsAndForPeople)
     EXPECT_THAT(print(inThatWeek({"--csv", "--unit", unit1})),
                 HasSubstr("mean_volume\n2026-11-16,7200.0,1,1,0.5\n2026-11-17,0.0,0,0,\n"));
     const std::string text = print(inThatWeek({"--by", "application"}));
-    EXPECT_THAT(text, HasSubstr("6.5 h played in 4 sessions · 12 faults, 1.85 an hour\n"
-                                "3 units; a unit played: median 2.0 h, 90 % up to 4.0 h, most 4.0 h\n"
-                                "faults an hour of a unit: median 2.00, 90 % up to 2.00, worst 2.00; of 2 that played "
-                                "an hour or more\n"));
+    EXPECT_THAT(text,
+                HasSubstr("6.5 h played in 4 sessions · 12 faults, 1.85 an hour\n"
+                          "3 units; a unit played: median 2.0 h, 90 % up to 4.0 h, most 4.0 h\n"
+                          "faults an hour of a unit: median 2.00, 90 % up to 2.00, worst 2.00; of 2 that played "
+                          "an hour or more\n"));
     EXPECT_THAT(text,
                 HasSubstr("APPLICATION   PLAYED  SHARE  VOLUME  FAULTS  /HOUR  UNITS  MEDIAN   90 %  WORST\n"
                           "player         6.2 h   96 %    50 %"));
@@ -147,8 +151,9 @@ TEST_F(ThreeUnits, AreTablesForProgramsAndForPeople)
 
 TEST_F(FleetReports, SayThatNothingWasPlayed)
 {
-    EXPECT_THAT(print(thatWeek), HasSubstr("Nothing that matches was played between 2026-11-16 00:00 and 2026-11-23 "
-                                           "00:00 on any unit whose reports have come.\n"));
+    EXPECT_THAT(print(thatWeek),
+                HasSubstr("Nothing that matches was played between 2026-11-16 00:00 and 2026-11-23 "
+                          "00:00 on any unit whose reports have come.\n"));
     EXPECT_EQ(at(json(thatWeek), "hours_of_units"), "(null)");
     EXPECT_EQ(at(json(inThatWeek({"--recording"})), "units"), "0");
 }
@@ -169,20 +174,61 @@ TEST_F(FleetReports, TakeNamesForNamesOnly)
 // SQLite itself says what matches.
 TEST_F(FleetReports, MatchAsTheReportOfADeviceDoes)
 {
-    const std::vector<std::string> names{"",    "a",    "A",     "ab",   "a.b", "a\nb", "aéb", "é",  "]",
-                                         "[",   "^",    "-",     "a-b",  "*",   "?",    "a?b", "\\", "a\\b",
+    const std::vector<std::string> names{"",    "a",    "A",     "ab",  "a.b", "a\nb", "aéb",  "é",  "]",
+                                         "[",   "^",    "-",     "a-b", "*",   "?",    "a?b",  "\\", "a\\b",
                                          "org", "x{2}", "(a|b)", "a'b", "z",   "ü",    "日本", "$",  "a$"};
-    const std::vector<std::string> globs{"*",      "?",       "a*",   "*b",      "a?b",    "[a-c]*", "[^a-c]*", "[]]",
-                                         "[^]]",   "[a",      "a[]b", "[a-]",    "[-a]",   "[z-a]",  "[é-ü]",   "[^é]",
-                                         "\\*",    "a\\b",    "a.b",  "x{2}",    "(a|b)",  "a'b",    "[*]",     "[?]",
-                                         "a[?]b",  "*[é]*",   "??",   "日?",     "[\\]",   "[^^]",   "[[]",     "$",
-                                         "a$",     "[a-c-z]", "",     "*a*b*",   "[.-.]",  "[!a]",   "^",       "[^-]"};
+    const std::vector<std::string> globs{"*",     "?",       "a*",   "*b",    "a?b",   "[a-c]*", "[^a-c]*", "[]]",
+                                         "[^]]",  "[a",      "a[]b", "[a-]",  "[-a]",  "[z-a]",  "[é-ü]",   "[^é]",
+                                         "\\*",   "a\\b",    "a.b",  "x{2}",  "(a|b)", "a'b",    "[*]",     "[?]",
+                                         "a[?]b", "*[é]*",   "??",   "日?",   "[\\]",  "[^^]",   "[[]",     "$",
+                                         "a$",    "[a-c-z]", "",     "*a*b*", "[.-.]", "[!a]",   "^",       "[^-]"};
     for (const std::string& glob : globs)
         for (const std::string& name : names)
-            EXPECT_EQ(server.select(
-                          fmt::format("SELECT match({}, {})", sqlText(name), sqlText(regularExpression(glob)))),
-                      matches(name, glob) ? "1" : "0")
+            EXPECT_EQ(
+                server.select(fmt::format("SELECT match({}, {})", sqlText(name), sqlText(regularExpression(glob)))),
+                matches(name, glob) ? "1" : "0")
                 << "\"" << name << "\" " << glob << " " << regularExpression(glob);
+}
+
+// Days of 23, 25 and 23.5 hours, and such that are cut at the ends of a span.
+TEST_F(FleetReports, FindDaysWhereverTheyBegin)
+{
+    constexpr std::int64_t hour = 3'600'000'000;
+    const std::vector<std::vector<std::int64_t>> lengths{{24},
+                                                         {3},
+                                                         {5, 2},
+                                                         {24, 24, 24},
+                                                         {24, 23, 24, 24, 25, 24, 1},
+                                                         {25, 24},
+                                                         {1, 25, 24, 23, 24},
+                                                         {10, 23, 23, 23, 24}};
+    for (const auto& hours : lengths) {
+        std::vector<std::int64_t> days{1794787200123456};
+        for (const std::int64_t each : hours)
+            days.push_back(days.back() + each * hour - hour / 2 * (each == 23 ? -1 : 0));
+        const DayTable table(days);
+        for (std::size_t day = 0; day + 1 < days.size(); ++day)
+            for (const std::int64_t moment : {days[day], days[day] + 1, days[day + 1] - 1})
+                EXPECT_EQ(server.select(fmt::format("SELECT {} FROM (SELECT toInt64({}) AS moment)",
+                                                    table.of("moment", "day"), moment)),
+                          fmt::format("{}", day))
+                    << fmt::format("{}", fmt::join(hours, " "));
+    }
+}
+
+TEST_F(ThreeUnits, AreAPage)
+{
+    const std::string page = print(inThatWeek({"--html", "-"}));
+    EXPECT_LT(page.size(), 100'000U);
+    EXPECT_THAT(page, HasSubstr("<h1>Audio report of a fleet</h1>"));
+    EXPECT_THAT(page,
+                HasSubstr("<h2>3 units</h2><p class=sub>Hours played by a unit: median 2.00 h, 90 % up to 4.00 h, "
+                          "most 4.00 h<p class=sub>Faults an hour of a unit: median 2.00, 90 % up to 2.00, most "
+                          "2.00; of 2 that played an hour or more"));
+    EXPECT_THAT(page, HasSubstr("<th scope=row><bdi>radio</bdi><td>1<td>30 min<td>2<td>3<td>6.00<td>–<td>–<td>–"));
+    EXPECT_THAT(page, HasSubstr("<h2>Worst units</h2>"));
+    EXPECT_THAT(page, HasSubstr("<th scope=row>1<br><span class=sub>" + unit2 + "</span>"));
+    EXPECT_THAT(page, Not(HasSubstr("<script")));
 }
 
 TEST_F(FleetReports, SayWhyTheDatabaseCannotBeAsked)
@@ -207,6 +253,16 @@ TEST_F(FleetReports, SayWhyTheDatabaseCannotBeAsked)
     EXPECT_THAT(failure({}), HasSubstr("the database of the fleet refuses a question: "));
     server.end();
     EXPECT_THAT(failure({}), HasSubstr("the database of the fleet cannot be asked: http://127.0.0.1:"));
+}
+
+TEST_F(FleetReports, DoNotTakeAnotherProgramForTheDatabase)
+{
+    const kesto_ingest::Metrics metrics;
+    const kesto_ingest::MetricsServer other(metrics, 0);
+    const Finished finished = tool.run({"report", "--fleet", fmt::format("http://127.0.0.1:{}", other.port())});
+    EXPECT_EQ(finished.status, 1);
+    EXPECT_EQ(finished.output, "");
+    EXPECT_THAT(finished.errors, HasSubstr("the database of the fleet cannot be asked: http://127.0.0.1:"));
 }
 
 TEST_F(FleetReports, AreAskedForByARightCommandLine)
