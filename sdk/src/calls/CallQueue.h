@@ -7,6 +7,11 @@
 //
 // If a caller is suspended between claiming and handing over, the reader cannot pass its record, but other callers go
 // on. The reader zeroes the room before it frees it; so a record with a head other than zero is complete.
+//
+// This holds on processors that reorder memory, too. A caller copies before it releases the head, and the reader
+// acquires the head before it reads the copy. The reader zeroes before it releases `read_`, and a caller acquires
+// `read_` before it claims that room; so the zeros come before the next head. An old `read_` only makes the room look
+// smaller. Claims have one order, that of the exchanges of `write_`.
 #pragma once
 
 #include <atomic>

@@ -3,6 +3,10 @@
 //
 // Values are atomic and independent: threads never wait for each other. A reader may see a value that is a moment old,
 // but a count never decreases, because that would make it a new channel.
+//
+// No change stays unwritten. A thread changes the value and then reads `isChanged_`; the publisher clears it and then
+// reads the value. All of these are sequentially consistent, so either the publisher sees the change, or the thread
+// sees the cleared flag and sets it again.
 #pragma once
 
 #include "Doorbell.h"

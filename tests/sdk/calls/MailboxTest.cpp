@@ -1,10 +1,14 @@
 // SPDX-License-Identifier: Apache-2.0
-// Which calls ring, and when: the promise that sending makes no system call while a session is started.
+// Which calls ring, and when: the promise that sending makes no system call while a session is started. And that the
+// thread always wakes up for what many threads put at the same time.
 #include "calls/Mailbox.h"
 
+#include <atomic>
 #include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/eventfd.h>
+#include <thread>
+#include <vector>
 
 namespace {
 
@@ -142,6 +146,54 @@ TEST_F(MailboxTest, CallsFindRoomWhenMessagesDoNotAnyMore)
     while (send()) { }
     EXPECT_TRUE(call(KESTO_OPERATION_STOP_SESSION));
     EXPECT_FALSE(send());
+}
+
+// Rounds in which each caller puts once, while the thread falls asleep because it finds nothing, and only the doorbell
+// wakes it. A caller and the thread that missed each other would leave it asleep over what is in the queue. The thread
+// looks more or less often before it falls asleep, so that the rounds differ.
+TEST_F(MailboxTest, TheThreadWakesUpForAllThatManyThreadsPut)
+{
+    constexpr int callers = 2;
+    constexpr int rounds = 20'000;
+    const auto put = [this](int number) {
+        switch (number % 8) {
+        case 0: return call(KESTO_OPERATION_START_SESSION);
+        case 2: return play(libkesto::streamStart);
+        case 4: return call(KESTO_OPERATION_STOP_SESSION);
+        case 6: return play(libkesto::streamOperation);
+        default: return send();
+        }
+    };
+    std::atomic<int> round = 0;
+    std::atomic<int> refused = 0;
+    std::vector<std::jthread> threads;
+    for (int caller = 0; caller < callers; ++caller)
+        threads.emplace_back([&, caller] {
+            for (int number = 1; number <= rounds; ++number) {
+                for (int looks = 0; round < number; ++looks)
+                    if (looks > 1'000)
+                        std::this_thread::yield();
+                refused += put(number + caller) ? 0 : 1;
+            }
+        });
+
+    int overslept = 0;
+    for (int number = 1; number <= rounds; ++number) {
+        round = number;
+        for (int taken = 0; taken < callers;) {
+            for (int looks = number % 20; looks >= 0; --looks)
+                for (; mailbox_.front(); ++taken)
+                    mailbox_.popFront();
+            if (taken == callers || !mailbox_.fallAsleep())
+                continue;
+            pollfd doorbell{mailbox_.doorbell(), POLLIN, 0};
+            const bool hasRung = ::poll(&doorbell, 1, overslept == 0 ? 10'000 : 1) > 0;
+            overslept += hasRung ? 0 : 1;
+            mailbox_.wakeUp(hasRung);
+        }
+    }
+    EXPECT_EQ(overslept, 0);
+    EXPECT_EQ(refused, 0);
 }
 
 } // namespace

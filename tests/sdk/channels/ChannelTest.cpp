@@ -4,7 +4,9 @@
 
 #include "platform/linux/channels/ChannelFile.h"
 
+#include <atomic>
 #include <gtest/gtest.h>
+#include <poll.h>
 #include <sys/eventfd.h>
 #include <thread>
 #include <unistd.h>
@@ -237,6 +239,45 @@ TEST_F(Channels, RingOnceWhenTheThreadIsAsleepAndElseNever)
     bell.fallAsleep();
     other.add(1);
     EXPECT_EQ(rings(), 1U) << "any channel";
+}
+
+// Rounds in which each of two threads adds once, while the publisher's thread falls asleep because nothing has changed,
+// and only the doorbell wakes it. One that missed the other would leave it asleep, and the last value unwritten.
+TEST_F(Channels, WakeTheThreadForEveryChangeOfManyThreads)
+{
+    constexpr int threads = 2;
+    constexpr int rounds = 20'000;
+    SimpleChannelValue channel(bell);
+    std::atomic<int> round = 0;
+    std::vector<std::jthread> adding;
+    for (int thread = 0; thread < threads; ++thread)
+        adding.emplace_back([&] {
+            for (int number = 1; number <= rounds; ++number) {
+                while (round < number)
+                    std::this_thread::yield();
+                channel.add(1);
+            }
+        });
+
+    int overslept = 0;
+    for (int number = 1; number <= rounds; ++number) {
+        round = number;
+        const std::string all = "simple\n" + std::to_string(number * threads) + "\n";
+        for (std::string text; text != all;) {
+            bell.fallAsleep();
+            if (!channel.isChanged()) {
+                pollfd watched{bell.descriptor(), POLLIN, 0};
+                const bool hasRung = ::poll(&watched, 1, overslept == 0 ? 10'000 : 1) > 0;
+                overslept += hasRung ? 0 : 1;
+                bell.wakeUp(hasRung);
+            }
+            bell.stayAwake();
+            channel.setChanged(false);
+            text.clear();
+            channel.appendText(text, begin);
+        }
+    }
+    EXPECT_EQ(overslept, 0);
 }
 
 TEST_F(Channels, OfTheMostStatesAndBucketsFitInAFileThatIsRead)
