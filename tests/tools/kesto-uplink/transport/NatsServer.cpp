@@ -86,7 +86,7 @@ void NatsServer::start()
 {
     const std::string configuration = directory_ / "node.conf";
     const std::string log = directory_ / "log";
-    const std::string port = std::to_string(port());
+    const std::string port = std::to_string(port_.number());
     process_ = ::fork();
     if (process_ == 0) {
         ::prctl(PR_SET_PDEATHSIG, SIGKILL);
