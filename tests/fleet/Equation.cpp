@@ -31,7 +31,7 @@ std::string rowsOf(Kind kind, const std::string& condition)
                            eventText, condition);
     case Kind::Stretch:
         return fmt::format("SELECT device, epoch, id, any({0}) AS text,"
-                           " any(toInt64(round(1000000 * seconds))) AS amount, uniqExact({0}, seconds) AS versions"
+                           " any(microseconds) AS amount, uniqExact({0}, microseconds) AS versions"
                            " FROM kesto.stretches{{}} {1} GROUP BY device, epoch, id",
                            stretchText, condition);
     case Kind::Session: break;

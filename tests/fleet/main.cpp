@@ -102,10 +102,16 @@ int main(int argc, char** argv)
     app.add_flag("--small", isSmall, "one server of each kind and few devices, in about a minute");
     std::string only;
     app.add_option("--only", only, "of the scenarios, the first and those with this text in their line");
+    std::size_t devices = 0;
+    app.add_option("--devices", devices, "so many made-up devices, in place of the edition's")
+        ->check(CLI::Range(10, 100'000));
     CLI11_PARSE(app, argc, argv);
+    fleet::Edition edition = isSmall ? fleet::smallEdition : fleet::wholeEdition;
+    if (devices > 0)
+        edition.devices = devices;
     std::signal(SIGPIPE, SIG_IGN);
     try {
-        return fleet::run(isSmall ? fleet::smallEdition : fleet::wholeEdition, only);
+        return fleet::run(edition, only);
     } catch (const std::exception& error) {
         fmt::print(stderr, "kesto_fleet: {}\n", error.what());
         return 2;

@@ -27,7 +27,7 @@ bool isFaultOfRows(const fleet_database::Answer& answer)
 // The answer then says that the rows are on their shard.
 ClickHouseConfiguration synchronous(ClickHouseConfiguration configuration)
 {
-    configuration.settings["insert_distributed_sync"] = "1";
+    configuration.settings.insert_or_assign("insert_distributed_sync", std::string("1"));
     return configuration;
 }
 
