@@ -106,8 +106,10 @@ Answer ClickHouseServers::askServer(const std::string& server, const std::string
         set(CURLOPT_USERNAME, configuration_.user.c_str());
         set(CURLOPT_PASSWORD, configuration_.password.c_str());
     }
-    if (!configuration_.certificateAuthority.empty())
+    if (!configuration_.certificateAuthority.empty()) {
         set(CURLOPT_CAINFO, configuration_.certificateAuthority.c_str());
+        set(CURLOPT_CAPATH, static_cast<const char*>(nullptr)); // those of the system
+    }
     if (const CURLcode code = curl_easy_perform(handle); code != CURLE_OK) {
         answer.text = fmt::format("{}: {}", server, error[0] == 0 ? curl_easy_strerror(code) : error.data());
         return answer;

@@ -85,8 +85,6 @@ void Ingest::fetch()
     }
     if (nextAttempt_)
         succeed();
-    if (taking_.batches.empty())
-        taking_.oldest = surroundings_.now();
     if (taking_.batches.empty() && storing_.batches.empty())
         heldOn_ = surroundings_.now();
     std::ranges::move(*deliveries, std::back_inserter(fetched_));
@@ -165,7 +163,14 @@ void Ingest::refuse(Delivery& delivery, Counter counter, std::string reason)
     metrics_.add(counter);
     surroundings_.log(fmt::format("the batch {} of {} is put aside: {}", delivery.sequence, delivery.subject, reason));
     taking_.bytes += delivery.payload.size();
-    taking_.batches.push_back({.delivery = std::move(delivery), .refusal = std::move(reason)});
+    hold({.delivery = std::move(delivery), .refusal = std::move(reason)});
+}
+
+void Ingest::hold(Held held)
+{
+    if (taking_.batches.empty())
+        taking_.oldest = surroundings_.now();
+    taking_.batches.push_back(std::move(held));
 }
 
 void Ingest::take(Delivery delivery)
@@ -204,8 +209,7 @@ void Ingest::take(Delivery delivery)
         taking_.add(row, limits_.rows);
     metrics_.waitingRows += batch->rows.size();
     const Confirmation confirmation = {credential, batch->device, batch->epoch, batch->last, delivery.isRepeated};
-    taking_.batches.push_back(
-        {.delivery = std::move(delivery), .badRows = std::move(batch->badRows), .confirmation = confirmation});
+    hold({.delivery = std::move(delivery), .badRows = std::move(batch->badRows), .confirmation = confirmation});
 }
 
 bool Ingest::isStored(milliseconds wait) const

@@ -67,6 +67,7 @@ private:
     [[nodiscard]] bool mustWaitForAnEarlierOne(const Delivery& delivery, const std::string& device);
     void giveBack(const Delivery& delivery, const std::string& device);
     void take(Delivery delivery);
+    void hold(Held held);
     void refuse(Delivery& delivery, Counter counter, std::string reason);
     [[nodiscard]] bool isDue() const;
     [[nodiscard]] bool isStoring() const { return stored_.valid(); }

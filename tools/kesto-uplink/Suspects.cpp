@@ -4,21 +4,19 @@
 
 #include "kesto-uplink/outbox/Outbox.h"
 
-#include <algorithm>
 #include <fmt/format.h>
 #include <optional>
 
 namespace kesto_uplink {
 
 namespace {
-constexpr std::int64_t newestIDs = 20'000;
+constexpr std::int64_t newestEvents = 20'000;
 }
 
 std::vector<std::string> suspects(const Places& places, const UplinkConfiguration& configuration)
 {
     Outbox outbox(places.database, configuration, newIdentity(0));
-    Cursor place = outbox.newest();
-    place.id = std::max<std::int64_t>(0, place.id - newestIDs);
+    Cursor place = outbox.beforeNewest(newestEvents);
     bool isEmpty = true;
     while (const auto batch = outbox.next(place, {}, 0)) {
         place = batch->last;

@@ -159,6 +159,40 @@ TEST_F(IngestTest, StoresNoLoadBeforeAnEarlierOneThatFailed)
     EXPECT_EQ(stream.unacknowledged(), 0U);
 }
 
+TEST_F(IngestTest, GivesBackBothLoadsThatItCannotStoreBeforeItEnds)
+{
+    isSlow = true;
+    send(deviceLine(1, 3) + eventLine(3));
+    turns(2);
+    send(deviceLine(4, 6) + eventLine(6));
+    turns(1);
+    database.isAway = true;
+    endWork();
+    ingest->finish();
+    database.isAway = isSlow = false;
+    ingest = makeIngest();
+    turns(4);
+    EXPECT_THAT(database.tables["events"], SizeIs(2));
+    EXPECT_EQ(stream.unacknowledged(), 0U);
+}
+
+TEST_F(IngestTest, JoinsWhatAFullLoadLeftWithWhatComesLater)
+{
+    ingest = makeIngest({.rows = 3, .joining = milliseconds{1000}});
+    stream.send("kesto.events.one", "nonsense"); // no row, so the next fetch brings several
+    turns(1);
+    send(deviceLine(1, 3) + eventLine(2) + eventLine(3));
+    send(deviceLine(4, 6) + eventLine(6));
+    turns(1);
+    now += milliseconds{1000};
+    turns(2); // stores the full load, and takes the rest
+    turns(1);
+    EXPECT_THAT(database.tables["events"], SizeIs(2)) << "the rest waits for others";
+    now += milliseconds{1000};
+    turns(1);
+    EXPECT_THAT(database.tables["events"], SizeIs(3));
+}
+
 TEST_F(IngestTest, WaitsForTheDatabaseBeforeItEnds)
 {
     isSlow = true;

@@ -71,6 +71,7 @@ public:
 
     // As those of StoreReader.
     [[nodiscard]] Cursor newest() { return store_.newest(); }
+    [[nodiscard]] Cursor beforeNewest(std::int64_t events) { return store_.beforeNewest(events); }
     [[nodiscard]] Cursor before(double time) { return store_.before(time); }
     // What stands in the file by mistake, as far as the batches so far tell.
     [[nodiscard]] std::vector<Unused> unused() const { return rows_.filter().unused(); }

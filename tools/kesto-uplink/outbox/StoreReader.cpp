@@ -241,6 +241,18 @@ Cursor StoreReader::newest()
     return cursor;
 }
 
+Cursor StoreReader::beforeNewest(std::int64_t events)
+{
+    Cursor cursor;
+    inTransaction([&] {
+        if (!isReady())
+            return;
+        cursor = newestNow();
+        cursor.id = idOf(fmt::format("SELECT id FROM events ORDER BY id DESC LIMIT 1 OFFSET {}", events)).value_or(0);
+    });
+    return cursor;
+}
+
 Cursor StoreReader::before(double time)
 {
     Cursor cursor;

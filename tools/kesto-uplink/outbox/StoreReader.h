@@ -77,6 +77,8 @@ public:
 
     // Behind everything; without an epoch if there is no store. Throws while that is not known.
     [[nodiscard]] Cursor newest();
+    // The place before the newest so many events.
+    [[nodiscard]] Cursor beforeNewest(std::int64_t events);
     // Before the first row of that time or later; behind everything if there is none.
     [[nodiscard]] Cursor before(double time);
 

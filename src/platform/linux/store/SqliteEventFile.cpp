@@ -2,6 +2,8 @@
 // What stands in memory and in the database, such as the next ID, changes with a transaction or is dropped with it.
 #include "platform/linux/store/SqliteEventFile.h"
 
+#include "platform/linux/store/tables/SkippedIDs.h"
+
 #include <cerrno>
 #include <fcntl.h>
 #include <fmt/format.h>
@@ -151,17 +153,24 @@ SqliteEventFile::Expected<> SqliteEventFile::beginRun()
     // The log of this transaction reaches the disk before an event can be read.
     if (const auto done = setSynchronization(StoreSynchronization::Full); !done)
         return done;
+    const bool isKnown = origins_.epoch == counts_.epoch();
+    const auto isLeft = OpenRun::isLeftByAnother(*connection_, origins_.bootIdentifier);
+    if (!isLeft)
+        return std::unexpected(isLeft.error());
+    if (*isLeft || (isKnown && counts.nextEvent < origins_.nextEvent)) {
+        counts.nextEvent += skippedEvents;
+        counts.nextSource += skippedOrigins;
+        counts.nextSession += skippedOrigins;
+    }
     ageClock_.emplace(clock_, counts.clock, counts.nextEvent);
     committedAgeClock_ = ageClock_;
-    const bool isKnown = origins_.epoch == counts_.epoch();
     if (!isKnown) {
         origins_.sources.forgetRows();
         origins_.sessions.forgetRows();
         stretches_.forgetRows();
     }
     const auto done = inTransaction([&]() -> Expected<> {
-        if (const auto begun = OpenRun::begin(*connection_, origins_.bootIdentifier, clock_.secondsSince1970(), counts);
-            !begun)
+        if (const auto begun = OpenRun::begin(*connection_, origins_.bootIdentifier, clock_.secondsSince1970()); !begun)
             return begun;
         if (const auto marked = ages_.markNow(counts.nextEvent, counts.clock.time); !marked)
             return marked;
@@ -313,6 +322,7 @@ SqliteEventFile::Expected<> SqliteEventFile::commit()
     if (const auto done = commit_.run(); !done)
         return done;
     counts_.noteCommit();
+    origins_.nextEvent = counts_.committed().nextEvent;
     origins_.committed();
     holders_.committed();
     ages_.committed();

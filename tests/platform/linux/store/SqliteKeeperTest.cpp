@@ -325,6 +325,39 @@ TEST_F(SqliteKeeperTest, SkipsTheNumbersThatALossOfPowerMayHaveTaken)
     EXPECT_EQ(StoreReader(file()).text("SELECT kept - removed FROM store"), "5");
 }
 
+TEST_F(SqliteKeeperTest, EventsBeforeALossOfPowerAreAsOldAsTheMachineWasOff)
+{
+    configuration.maximumAgeDays = 1;
+    keep({event(1)});
+    closeWriter();
+    noteRunOfTheMachine("00000000-0000-4000-8000-000000000001");
+    clock.advance(20 * hour);
+    keep({event(2)});
+    clock.advance(5 * hour);
+    maintain();
+    EXPECT_EQ(StoreReader(file()).text("SELECT group_concat(id) FROM events"), "1000000002");
+}
+
+TEST_F(SqliteKeeperTest, SkipsTheNumbersOfADiskThatHasForgotten)
+{
+    keep({event(1), event(2)});
+    const fs::path copy = directory / "copy";
+    StoreReader(file()).execute("VACUUM INTO '" + copy.native() + "'");
+    keep({event(3), event(4)});
+    fs::rename(copy, file());
+    keep({event(5)});
+    EXPECT_EQ(StoreReader(file()).text("SELECT group_concat(id) FROM events"), "1,2,1000000003");
+}
+
+TEST_F(SqliteKeeperTest, SkipsNumbersWhereTheKernelDoesNotNameItsRuns)
+{
+    keep({event(1)});
+    closeWriter();
+    noteRunOfTheMachine("");
+    keep({event(2)});
+    EXPECT_EQ(StoreReader(file()).text("SELECT max(id) FROM events"), "1000000002");
+}
+
 TEST_F(SqliteKeeperTest, SkipsNoNumbersAfterAnEndInOrder)
 {
     keep({event(1)});

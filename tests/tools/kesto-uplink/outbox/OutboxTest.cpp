@@ -146,6 +146,18 @@ TEST_F(UplinkOutbox, DoesNotCountTheNumbersThatTheStoreSkippedAfterALossOfPower)
     EXPECT_EQ(next(1)->leftOut.lostToAge, 2) << "the second and the third";
 }
 
+TEST_F(UplinkOutbox, FindsThePlaceBeforeTheNewestEvents)
+{
+    EXPECT_EQ(outbox().beforeNewest(2), Cursor()) << "there is no store";
+    MadeEventStore store(database);
+    for (int count = 0; count < 5; ++count)
+        store.addEvent(start);
+    store.execute("UPDATE store SET next_event = next_event + 1000000000");
+    store.addEvent(start);
+    EXPECT_EQ(outbox().beforeNewest(2), (Cursor{epoch, 4}));
+    EXPECT_EQ(outbox().beforeNewest(6), (Cursor{epoch, 0}));
+}
+
 TEST_F(UplinkOutbox, CountsWhatAgedOutBeforeItWasRead)
 {
     MadeEventStore store(database);

@@ -120,6 +120,7 @@ struct KnownOrigins {
     KnownOriginsOf<SessionBegin> sessions;
     std::string bootIdentifier; // of this run of the machine
     std::string epoch; // of the database that has the rows
+    std::int64_t nextEvent = 0; // in it, after the last transaction
 
     void begin(const OriginAnnouncements& announced);
     void end(const OriginAnnouncements& announced);

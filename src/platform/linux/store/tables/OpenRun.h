@@ -4,7 +4,6 @@
 #pragma once
 
 #include "platform/linux/store/SqliteConnection.h"
-#include "platform/linux/store/tables/StoreSchema.h"
 
 #include <string_view>
 
@@ -12,10 +11,13 @@ namespace platform {
 
 class OpenRun {
 public:
-    // Inside a transaction that must reach the disk: notes this run, and skips IDs if another run of the machine did
-    // not close the database.
+    // Whether another run of the machine did not close the database. Where the kernel does not name its runs, whether
+    // anybody did not.
+    [[nodiscard]] static StoreExpected<bool> isLeftByAnother(SqliteConnection& connection,
+                                                             std::string_view bootIdentifier);
+    // Notes this run, inside a transaction that must reach the disk; `now` is for people.
     [[nodiscard]] static StoreExpected<> begin(SqliteConnection& connection, std::string_view bootIdentifier,
-                                               double now, StoreCounts& counts);
+                                               double now);
     // The database is closed in order. If this does not reach the disk, the next run skips IDs for nothing.
     [[nodiscard]] static StoreExpected<> end(SqliteConnection& connection);
 };
