@@ -13,6 +13,7 @@
 #include <sqlite3.h>
 #include <stdexcept>
 #include <sys/mount.h>
+#include <sys/prctl.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
 #include <thread>
@@ -94,6 +95,7 @@ void Kestod::start(const InheritedDescriptors& inherited)
     const fs::path logPath = directory() / "log";
     process_ = ::fork();
     if (process_ == 0) {
+        ::prctl(PR_SET_PDEATHSIG, SIGKILL); // a test that is killed leaves nothing behind
         if (!hidden_.empty()
             && (::unshare(CLONE_NEWNS) != 0 || ::mount("none", hidden_.c_str(), "tmpfs", 0, nullptr) != 0))
             ::_exit(127);
