@@ -118,7 +118,7 @@ void Broker::asAdministrator(const std::function<void(jsCtx*)>& work)
 
 StreamState Broker::stream()
 {
-    StreamState state;
+    StreamState state{.messages = UINT64_MAX}; // while no server tells
     asAdministrator([&state](jsCtx* context) {
         jsStreamInfo* facts = nullptr;
         if (js_GetStreamInfo(&facts, context, "KESTO", nullptr, nullptr) == NATS_OK)
@@ -140,6 +140,8 @@ std::size_t Broker::leader()
     std::string name;
     waitUntil("the stream has a leader", [&] { return !(name = stream().leader).empty(); });
     const auto found = std::ranges::find_if(servers_, [&](const auto& server) { return server->name() == name; });
+    if (found == servers_.end())
+        throw std::runtime_error("no server of the broker is called " + name);
     return static_cast<std::size_t>(found - servers_.begin());
 }
 

@@ -171,12 +171,12 @@ void Device::noteChapter(const std::string& pseudonym, std::int64_t before)
     chapters_.push_back({.pseudonym = pseudonym, .store = store(), .after = before});
 }
 
-void Device::sendUntil(const std::function<bool()>& isDone)
+void Device::sendUntil(const std::function<bool()>& isDone, std::chrono::milliseconds waitForConfirmation)
 {
     constexpr std::chrono::milliseconds pause{200};
     const auto end = std::chrono::steady_clock::now() + patience;
     while (!isDone()) {
-        const auto result = round();
+        const auto result = round(waitForConfirmation);
         if (isDone())
             return;
         if (std::chrono::steady_clock::now() > end)
@@ -186,17 +186,18 @@ void Device::sendUntil(const std::function<bool()>& isDone)
     }
 }
 
-void Device::sendAll()
+void Device::sendAll(std::chrono::milliseconds waitForConfirmation)
 {
-    sendUntil([this] { return isAllSent(); });
+    sendUntil([this] { return isAllSent(); }, waitForConfirmation);
 }
 
 void Device::sendAllAndHear()
 {
-    sendUntil([this] {
+    const auto hasHeard = [this] {
         State state = State::open(this->state(), now());
         return isAllSent() && state.queued() == state.stored();
-    });
+    };
+    sendUntil(hasHeard, std::chrono::seconds(2));
 }
 
 bool Device::isAllSent()

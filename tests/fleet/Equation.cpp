@@ -19,9 +19,10 @@ std::string rowsOf(Kind kind, const std::string& condition)
 {
     constexpr const char* eventText = "concat(toString(id), '|', toString(session), '|', name, '|',"
                                       " visitParamExtractString(payload, 'active_devices'), '|',"
-                                      " visitParamExtractString(payload, 'late_cycles'))";
+                                      " visitParamExtractString(payload, 'late_cycles'), '|', toString(happened_us))";
     constexpr const char* stretchText = "concat(toString(id), '|', toString(session), '|', toString(recording), '|',"
-                                        " audio_device, '|', format)";
+                                        " audio_device, '|', format, '|', ending, '|', ifNull(toString(channels), ''),"
+                                        " '|', ifNull(toString(volume_millionths), ''), '|', toString(began_us))";
     switch (kind) {
     case Kind::Event:
         return fmt::format("SELECT device, epoch, id, any({0}) AS text,"
@@ -122,6 +123,8 @@ Equality compare(DatabaseCluster& database, const SumsOfRows& truth, const Chapt
     Equality equality;
     for (const auto& [of, sums] : truth)
         equality.rows += sums.rows;
+    if (equality.rows == 0)
+        equality.differences.emplace_back("the devices allow no row, so nothing is compared");
     for (int replica = 1; replica <= database.replicas(); ++replica) {
         const SumsOfRows stored = sumsIn(database, replica);
         std::vector<RowsOf> different;

@@ -74,7 +74,7 @@ void Fleet::withDevices(std::size_t count, const std::function<void(Device&)>& w
     std::vector<std::future<void>> workers;
     for (std::size_t worker = 0; worker < edition.workers; ++worker)
         workers.push_back(std::async(std::launch::async, [&] {
-            for (std::size_t number = next++; number < count; number = next++) {
+            for (std::size_t number = next++; number < count && !isGivenUp_; number = next++) {
                 work(*devices[number]);
                 ++done_;
             }
@@ -92,7 +92,12 @@ void Fleet::withDevicesWhile(std::size_t count, const std::function<void(Device&
     auto all = std::async(std::launch::async, [&] { withDevices(count, work); });
     waitUntil("a quarter of the devices is done",
               [&] { return done_ >= count / 4 || all.wait_for(std::chrono::seconds(0)) == std::future_status::ready; });
-    happen();
+    try {
+        happen();
+    } catch (...) {
+        isGivenUp_ = true; // the others would wait for what does not come
+        throw;
+    }
     all.get();
 }
 

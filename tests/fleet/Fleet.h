@@ -76,6 +76,7 @@ public:
 
 private:
     std::atomic<std::size_t> done_ = 0;
+    std::atomic<bool> isGivenUp_ = false;
     Truth truth_;
 };
 

@@ -59,6 +59,11 @@ std::string text(sqlite3_stmt* row, int column)
     return bytes == nullptr ? std::string() : reinterpret_cast<const char*>(bytes);
 }
 
+std::int64_t whole(sqlite3_stmt* row, int column)
+{
+    return static_cast<std::int64_t>(std::nearbyint(sqlite3_column_double(row, column)));
+}
+
 // Events that the rules let leave, each with an ID in the range.
 constexpr std::string_view leavingEvents = "name GLOB 'com.quarn.kesto.*' AND id > ?1 AND id <= ?2";
 
@@ -71,11 +76,14 @@ std::string queryOf(Kind kind)
             " || '|' || ifnull(payload ->> '$.active_devices', '') || '|' || CASE"
             " WHEN payload ->> '$.late_cycles' < 10 THEN '<10' WHEN payload ->> '$.late_cycles' < 100 THEN '10-100'"
             " WHEN payload ->> '$.late_cycles' >= 100 THEN '>=100' ELSE '' END,"
-            " 1000000 * ifnull(payload ->> '$.PomoSessionVolume', 0) FROM events WHERE {} ORDER BY id",
+            " 1000000 * ifnull(payload ->> '$.PomoSessionVolume', 0), 1000000 * ifnull(happened, time) FROM events "
+            "WHERE {} ORDER BY id",
             leavingEvents);
     case Kind::Stretch:
         return "SELECT id, id || '|' || ifnull(session, 0) || '|' || recording || '|' || ifnull(device, '') || '|'"
-               " || ifnull(format, ''), 1000000 * seconds FROM stretches WHERE id > ?1 AND id <= ?2 ORDER BY id";
+               " || ifnull(format, '') || '|' || ending || '|' || ifnull(channels, '') || '|'"
+               " || ifnull(CAST(round(1000000 * volume) AS INTEGER), ''), 1000000 * seconds, 1000000 * began FROM "
+               "stretches WHERE id > ?1 AND id <= ?2 ORDER BY id";
     case Kind::Session:
         return fmt::format("SELECT id, id || '|' || application || '|' || ifnull(service, ''), ended IS NOT NULL"
                            " FROM sessions WHERE id IN (SELECT session FROM events WHERE {} UNION"
@@ -115,8 +123,8 @@ void forEachRow(const Chapter& chapter, Kind kind, const std::function<void(cons
     const Database database = open(chapter.store);
     select(*database, queryOf(kind), {chapter.after, endOf(chapter)}, [&](sqlite3_stmt* row) {
         read({.id = sqlite3_column_int64(row, 0),
-              .text = text(row, 1),
-              .amount = static_cast<std::int64_t>(std::nearbyint(sqlite3_column_double(row, 2)))});
+              .text = text(row, 1) + (kind == Kind::Session ? "" : fmt::format("|{}", whole(row, 3))),
+              .amount = whole(row, 2)});
     });
 }
 

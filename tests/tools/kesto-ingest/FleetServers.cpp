@@ -80,7 +80,7 @@ std::string ask(const std::string& address, const std::string& body)
 void waitUntil(const std::string& what, const std::function<bool()>& holds)
 {
     constexpr std::chrono::milliseconds step{20};
-    constexpr std::chrono::seconds longest{90};
+    constexpr std::chrono::seconds longest{240};
     const auto end = std::chrono::steady_clock::now() + longest;
     while (!holds()) {
         if (std::chrono::steady_clock::now() >= end)
