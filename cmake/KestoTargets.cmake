@@ -119,7 +119,7 @@ function(kesto_test name)
   set_target_properties(${name} PROPERTIES UNITY_BUILD ${KESTO_TEST_BATCHES} UNITY_BUILD_BATCH_SIZE 4)
   set_source_files_properties(${arg_ALONE} PROPERTIES SKIP_UNITY_BUILD_INCLUSION ON)
   set(seconds 120)
-  if(KESTO_SANITIZE) # under which a program takes many times as long
+  if(KESTO_SANITIZE OR CMAKE_CROSSCOMPILING) # a sanitizer or an emulator takes many times as long
     set(seconds 600)
   endif()
   set(left_out)
