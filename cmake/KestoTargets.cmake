@@ -20,6 +20,11 @@ endif()
 # In debug builds the standard library checks its callers, too, such as an index within bounds.
 add_compile_definitions($<$<CONFIG:Debug>:_GLIBCXX_ASSERTIONS>)
 
+# On processors of 32 bits, too, times go beyond 2038 and files beyond 2 GiB.
+if(CMAKE_SIZEOF_VOID_P EQUAL 4)
+  add_compile_definitions(_TIME_BITS=64 _FILE_OFFSET_BITS=64)
+endif()
+
 # Locks are annotated; clang proves that guarded data is used only while the lock is held. g++'s own <algorithm> uses
 # deprecated functions, for which only clang warns; g++ itself warns of the project's uses.
 add_compile_options(-Wall -Wextra -Wpedantic -Wshadow -Wimplicit-fallthrough $<$<BOOL:${KESTO_WERROR}>:-Werror>
@@ -114,7 +119,7 @@ function(kesto_test name)
   set_target_properties(${name} PROPERTIES UNITY_BUILD ${KESTO_TEST_BATCHES} UNITY_BUILD_BATCH_SIZE 4)
   set_source_files_properties(${arg_ALONE} PROPERTIES SKIP_UNITY_BUILD_INCLUSION ON)
   set(seconds 120)
-  if(KESTO_SANITIZE) # under which a program takes many times as long
+  if(KESTO_SANITIZE OR CMAKE_CROSSCOMPILING) # a sanitizer or an emulator takes many times as long
     set(seconds 600)
   endif()
   set(left_out)

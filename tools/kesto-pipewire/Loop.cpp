@@ -1,6 +1,9 @@
 // SPDX-License-Identifier: Apache-2.0
 // PipeWire's loop calls back with a pointer. Its target lives until the callback has returned, even if the callback
 // destroys its own source.
+//
+// Timers are the system's own descriptors, which the loop only watches: PipeWire's timers take a `timespec`, which on a
+// processor of 32 bits may be another in PipeWire than here.
 #include "kesto-pipewire/Loop.h"
 
 #include <pipewire/loop.h>
@@ -8,9 +11,12 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <chrono>
 #include <cmath>
 #include <ctime>
+#include <sys/timerfd.h>
 #include <system_error>
+#include <unistd.h>
 #include <utility>
 
 namespace kesto_pipewire {
@@ -92,7 +98,15 @@ template <typename Start> Source Loop::watch(Source::Callback callback, Start st
 Source Loop::addTimer(Source::Callback callback)
 {
     return watch(std::move(callback), [this](void* data) {
-        return pw_loop_add_timer(raw(), [](void* watched, std::uint64_t) { Source::Watched::fire(watched); }, data);
+        constexpr bool closeWithSource = true;
+        return pw_loop_add_io(
+            raw(), ::timerfd_create(CLOCK_MONOTONIC, TFD_NONBLOCK | TFD_CLOEXEC), SPA_IO_IN, closeWithSource,
+            [](void* watched, int timer, std::uint32_t) {
+                std::uint64_t expirations = 0;
+                if (::read(timer, &expirations, sizeof expirations) > 0)
+                    Source::Watched::fire(watched);
+            },
+            data);
     });
 }
 
@@ -121,14 +135,18 @@ Source Loop::addWakeup(Source::Callback callback)
 
 void Loop::arm(Source& timer, double seconds)
 {
-    const auto nanoseconds = std::llround(std::max(seconds, 1e-6) * 1e9); // a time of 0 would disarm it
-    timespec value{nanoseconds / 1'000'000'000, nanoseconds % 1'000'000'000};
-    pw_loop_update_timer(raw(), timer.watched_->source, &value, nullptr, false);
+    const std::chrono::nanoseconds time(std::llround(std::max(seconds, 1e-6) * 1e9)); // a time of 0 would disarm it
+    const auto whole = std::chrono::floor<std::chrono::seconds>(time);
+    itimerspec value{};
+    value.it_value.tv_sec = static_cast<std::time_t>(whole.count());
+    value.it_value.tv_nsec = static_cast<long>((time - whole).count());
+    ::timerfd_settime(timer.watched_->source->fd, 0, &value, nullptr);
 }
 
 void Loop::disarm(Source& timer)
 {
-    pw_loop_update_timer(raw(), timer.watched_->source, nullptr, nullptr, false);
+    constexpr itimerspec never{};
+    ::timerfd_settime(timer.watched_->source->fd, 0, &never, nullptr);
 }
 
 void Loop::wake(Source& wakeup)

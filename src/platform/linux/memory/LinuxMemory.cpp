@@ -13,9 +13,10 @@
 namespace platform {
 namespace {
 
-std::size_t bytesOfPages(long pages)
+// A machine may have more memory than a process of 32 bits has addresses.
+std::uint64_t bytesOfPages(long pages)
 {
-    return static_cast<std::size_t>(pages) * static_cast<std::size_t>(::sysconf(_SC_PAGESIZE));
+    return static_cast<std::uint64_t>(pages) * static_cast<std::uint64_t>(::sysconf(_SC_PAGESIZE));
 }
 
 } // namespace
@@ -27,7 +28,7 @@ std::size_t LinuxMemory::residentBytes()
     long mapped = 0;
     long resident = 0;
     statm >> mapped >> resident;
-    return bytesOfPages(resident);
+    return static_cast<std::size_t>(bytesOfPages(resident));
 }
 
 LinuxMemory::LinuxMemory(WorkQueues& queues, ConfigurationWatcher& watcher, ProviderLog log, std::size_t (*resident)())

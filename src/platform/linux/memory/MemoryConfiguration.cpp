@@ -5,6 +5,7 @@
 #include "platform/linux/settings/CheckedSettings.h"
 
 #include <algorithm>
+#include <limits>
 
 namespace platform {
 
@@ -14,6 +15,8 @@ namespace {
 
 constexpr double mostMegabytes = 1024.0 * 1024;
 constexpr double bytesOfAMegabyte = 1024.0 * 1024;
+// The other half is for the service's own work.
+constexpr double addressableBytes = static_cast<double>(std::numeric_limits<std::size_t>::max()) / 2;
 
 struct Settings {
     double bytes;
@@ -38,7 +41,7 @@ constexpr Setting<Settings> table[] = {
          const auto megabytes = positiveNumberOf(value);
          if (!megabytes || *megabytes < 1 || *megabytes > mostMegabytes)
              return false;
-         settings.bytes = *megabytes * bytesOfAMegabyte;
+         settings.bytes = std::min(*megabytes * bytesOfAMegabyte, addressableBytes);
          return true;
      }},
     {"memory_part_of_user", part,
@@ -48,10 +51,11 @@ constexpr Setting<Settings> table[] = {
 
 } // namespace
 
-CheckedMemoryLimits readMemoryLimits(const foundation::Dictionary& values, std::size_t bytesOfTheMachine)
+CheckedMemoryLimits readMemoryLimits(const foundation::Dictionary& values, std::uint64_t bytesOfTheMachine)
 {
-    Settings settings{.bytes = static_cast<double>(std::clamp(bytesOfTheMachine / DefaultMemory::partOfTheMachine,
-                                                              DefaultMemory::least, DefaultMemory::most))};
+    Settings settings{
+        .bytes = static_cast<double>(std::clamp<std::uint64_t>(bytesOfTheMachine / DefaultMemory::partOfTheMachine,
+                                                               DefaultMemory::least, DefaultMemory::most))};
     CheckedMemoryLimits checked;
     checked.problems = readSettings<Settings>(values, table, settings);
     const double ofAUser = settings.bytes * settings.partOfAUser;

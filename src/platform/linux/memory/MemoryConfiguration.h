@@ -7,6 +7,7 @@
 #include "platform/Memory.h"
 
 #include <cstddef>
+#include <cstdint>
 #include <string>
 #include <vector>
 
@@ -27,7 +28,8 @@ struct CheckedMemoryLimits {
     std::vector<std::string> problems;
 };
 
-// For a machine with so many bytes of memory. Any thread.
-[[nodiscard]] CheckedMemoryLimits readMemoryLimits(const foundation::Dictionary& values, std::size_t bytesOfTheMachine);
+// For a machine with so many bytes of memory, which may be more than this process has addresses. Any thread.
+[[nodiscard]] CheckedMemoryLimits readMemoryLimits(const foundation::Dictionary& values,
+                                                   std::uint64_t bytesOfTheMachine);
 
 } // namespace platform
