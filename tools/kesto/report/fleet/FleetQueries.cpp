@@ -61,8 +61,10 @@ std::string setAt(std::string_view glob, std::size_t& place)
     }
     std::string_view before; // may begin a range
     for (bool isFirst = true; place < glob.size(); isFirst = false) {
-        if (glob[place] == ']' && !isFirst)
-            return ++place, set + ']';
+        if (glob[place] == ']' && !isFirst) {
+            ++place;
+            return set + ']';
+        }
         const bool isRange = glob[place] == '-' && !before.empty() && place + 1 < glob.size() && glob[place + 1] != ']';
         place += isRange ? 1 : 0;
         const std::string_view character = characterAt(glob, place);
