@@ -25,8 +25,8 @@ std::string DayTable::of(std::string_view moment, std::string_view name) const
 {
     const std::string guess = fmt::format("{}_guess", name);
     const std::string day =
-        fmt::format("(intDiv({0} - {1}, {2}) AS {3}) + ({0} >= {4}) - ({0} < {5})", moment, first_, microsecondsADay,
-                    guess, beginning(fmt::format("({} + 1)", guess)), beginning(guess));
+        fmt::format("(intDiv(greatest({0} - {1}, 0), {2}) AS {3}) + ({0} >= {4}) - ({0} < {5})", moment, first_,
+                    microsecondsADay, guess, beginning(fmt::format("({} + 1)", guess)), beginning(guess));
     return fmt::format("toInt64(least(greatest({}, 0), {})) AS {}", day, last_, name);
 }
 

@@ -61,8 +61,10 @@ std::string setAt(std::string_view glob, std::size_t& place)
     }
     std::string_view before; // may begin a range
     for (bool isFirst = true; place < glob.size(); isFirst = false) {
-        if (glob[place] == ']' && !isFirst)
-            return ++place, set + ']';
+        if (glob[place] == ']' && !isFirst) {
+            ++place;
+            return set + ']';
+        }
         const bool isRange = glob[place] == '-' && !before.empty() && place + 1 < glob.size() && glob[place + 1] != ']';
         place += isRange ? 1 : 0;
         const std::string_view character = characterAt(glob, place);
@@ -356,13 +358,13 @@ std::string FleetQueries::all() const
 {
     const std::string floor = isAboveFloor();
     return fmt::format(
-        "SELECT sum(played), sum(muted), sum(without), sum(volume), sum(faults), sum(sessions), sum(vanished),"
-        " countIf(sessions > 0), {}, countIf({}), {}, groupArrayIf({})(toString(u), all != different),"
+        "SELECT sum(played), sum(muted), sum(untold), sum(volume), sum(faults), sum(sessions), sum(vanished),"
+        " countIf(sessions > 0), {}, countIf({}), {}, groupArrayIf({})(toString(u), counted != different),"
         " arrayMap(x -> toString(x.2), arraySlice(arrayReverseSort(groupArrayIf(({}, u), faults > 0 AND {})), 1, 10))"
-        " FROM (SELECT u1 AS u, sum(played1) AS played, sum(muted1) AS muted, sum(without1) AS without,"
+        " FROM (SELECT u1 AS u, sum(played1) AS played, sum(muted1) AS muted, sum(untold1) AS untold,"
         " sum(volume1) AS volume, sum(faults1) AS faults, sum(sessions1) AS sessions, sum(vanished1) AS vanished,"
-        " sum(rows1) AS all, sum(different1) AS different FROM (SELECT any(u) AS u1, sum(us) AS played1,"
-        " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS without1,"
+        " sum(rows1) AS counted, sum(different1) AS different FROM (SELECT any(u) AS u1, sum(us) AS played1,"
+        " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS untold1,"
         " sum(toInt64(round(us * (greatest(v, 0) / 1000000)))) AS volume1, sum(f) AS faults1,"
         " uniqExactIf(n, f = 0) AS sessions1, uniqExactIf(n, gone) AS vanished1, countIf(f = 0) AS rows1,"
         " uniqExactIf(toUInt32(r), f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
