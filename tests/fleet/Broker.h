@@ -17,9 +17,9 @@
 
 namespace fleet {
 
-// Members of the stream of batches; names are those of NatsServer.
+// Of the stream of batches, for its consumer. The leader's name is that of NatsServer.
 struct StreamState {
-    std::uint64_t messages = 0; // that wait
+    std::uint64_t waiting = 0; // messages that are not acknowledged
     std::uint64_t bytes = 0;
     std::string leader = {}; // empty: none, for now
     bool isComplete = false; // each member has all
@@ -34,6 +34,8 @@ public:
     [[nodiscard]] std::vector<std::string> addresses() const;
     [[nodiscard]] std::string configuredAddresses() const; // as a list of TOML
 
+    // A server that is killed may find messages again that were acknowledged before. These do not wait: the consumer
+    // knows better, and they are not given to anybody.
     [[nodiscard]] StreamState stream();
     void awaitWhole(); // a leader, and all members have all
     // The numbers of servers. With one server, both are that one.

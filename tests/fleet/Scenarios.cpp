@@ -181,7 +181,7 @@ void killIngest(Fleet& fleet)
     way.loseAnswersWith("");
     liveAndSend(*fleet.devices.front());
     waitUntil("the database answers", [&] { return way.hasLostAnAnswer(); });
-    expect(fleet.broker.stream().messages > 0, "the ingest acknowledges nothing before the database answers");
+    expect(fleet.broker.stream().waiting > 0, "the ingest acknowledges nothing before the database answers");
     copy.kill();
     fleet.startIngests();
 }
@@ -201,7 +201,8 @@ void killDatabase(Fleet& fleet)
     });
     if (isAlone)
         return;
-    waitUntil("the other replica takes all", [&] { return fleet.broker.stream().messages == 0; });
+    waitUntil("the other replica takes all",
+              [&] { return fleet.broker.stream().isComplete && fleet.broker.stream().waiting == 0; });
     server.start();
 }
 
