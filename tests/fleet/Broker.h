@@ -34,8 +34,7 @@ public:
     [[nodiscard]] std::vector<std::string> addresses() const;
     [[nodiscard]] std::string configuredAddresses() const; // as a list of TOML
 
-    // A server that is killed may find messages again that were acknowledged before. These do not wait: the consumer
-    // knows better, and they are not given to anybody.
+    // A stream may keep messages that its consumer gives to nobody any more: these do not count as waiting.
     [[nodiscard]] StreamState stream();
     void awaitWhole(); // a leader, and all members have all
     // The numbers of servers. With one server, both are that one.
