@@ -50,7 +50,7 @@ void check(natsStatus status, const char* what)
 
 StreamState stateIn(const jsStreamInfo& facts)
 {
-    StreamState state{.messages = facts.State.Msgs, .bytes = facts.State.Bytes, .leader = {}, .isComplete = true};
+    StreamState state{.waiting = 0, .bytes = facts.State.Bytes, .leader = {}, .isComplete = true};
     if (facts.Cluster == nullptr)
         return state;
     state.leader = facts.Cluster->Leader == nullptr ? "" : facts.Cluster->Leader;
@@ -118,11 +118,16 @@ void Broker::asAdministrator(const std::function<void(jsCtx*)>& work)
 
 StreamState Broker::stream()
 {
-    StreamState state{.messages = UINT64_MAX}; // while no server tells
+    StreamState state{.waiting = UINT64_MAX}; // while no server tells
     asAdministrator([&state](jsCtx* context) {
         jsStreamInfo* facts = nullptr;
-        if (js_GetStreamInfo(&facts, context, "KESTO", nullptr, nullptr) == NATS_OK)
+        jsConsumerInfo* consumer = nullptr;
+        if (js_GetStreamInfo(&facts, context, "KESTO", nullptr, nullptr) == NATS_OK
+            && js_GetConsumerInfo(&consumer, context, "KESTO", "ingest", nullptr, nullptr) == NATS_OK) {
             state = stateIn(*facts);
+            state.waiting = consumer->NumPending + static_cast<std::uint64_t>(consumer->NumAckPending);
+        }
+        jsConsumerInfo_Destroy(consumer);
         jsStreamInfo_Destroy(facts);
     });
     return state;

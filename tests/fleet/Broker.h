@@ -17,9 +17,9 @@
 
 namespace fleet {
 
-// Members of the stream of batches; names are those of NatsServer.
+// Of the stream of batches, for its consumer. The leader's name is that of NatsServer.
 struct StreamState {
-    std::uint64_t messages = 0; // that wait
+    std::uint64_t waiting = 0; // messages that are not acknowledged
     std::uint64_t bytes = 0;
     std::string leader = {}; // empty: none, for now
     bool isComplete = false; // each member has all
@@ -34,6 +34,7 @@ public:
     [[nodiscard]] std::vector<std::string> addresses() const;
     [[nodiscard]] std::string configuredAddresses() const; // as a list of TOML
 
+    // A stream may keep messages that its consumer gives to nobody any more: these do not count as waiting.
     [[nodiscard]] StreamState stream();
     void awaitWhole(); // a leader, and all members have all
     // The numbers of servers. With one server, both are that one.

@@ -107,7 +107,7 @@ Equality Fleet::settle()
         device->uplink().awaitAllSent();
     waitUntil("the ingest has taken all from the stream", [this] {
         const StreamState state = broker.stream();
-        return state.isComplete && state.messages == 0;
+        return state.isComplete && state.waiting == 0;
     });
     database.awaitReplicas();
     Chapters chapters;

@@ -42,15 +42,16 @@ void measureIngest(Fleet& fleet)
     auto begin = std::chrono::steady_clock::now();
     fleet.withDevices(fleet.devices.size(), [](Device& device) { device.sendAll(std::chrono::milliseconds(0)); });
     figures.secondsOfSending = secondsSince(begin);
-    const StreamState waiting = fleet.broker.stream();
-    figures.batches = waiting.messages;
-    figures.bytesInStream = waiting.bytes;
+    const StreamState before = fleet.broker.stream();
+    figures.batches = before.waiting;
+    figures.bytesInStream = before.bytes;
     begin = std::chrono::steady_clock::now();
     fleet.startIngests();
     waitUntil("the ingest has emptied the stream", [&] {
         for (const auto& copy : fleet.ingests)
             figures.peakOfIngest = std::max(figures.peakOfIngest, memoryOf(copy->process()).peak);
-        return fleet.broker.stream().messages == 0;
+        const StreamState state = fleet.broker.stream();
+        return state.isComplete && state.waiting == 0;
     });
     figures.secondsOfIngest = secondsSince(begin);
     figures.rowsOfWeeks = static_cast<std::uint64_t>(fleet.metric(rowsStored));

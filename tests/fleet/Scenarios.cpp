@@ -182,7 +182,7 @@ void killIngest(Fleet& fleet)
     liveAndSend(*fleet.devices.front());
     waitUntil("the database answers", [&] { return way.hasLostAnAnswer(); });
     const StreamState stream = fleet.broker.stream();
-    expect(stream.isComplete && stream.messages > 0, "the ingest acknowledges nothing before the database answers");
+    expect(stream.isComplete && stream.waiting > 0, "the ingest acknowledges nothing before the database answers");
     copy.kill();
     fleet.startIngests();
 }
@@ -202,7 +202,8 @@ void killDatabase(Fleet& fleet)
     });
     if (isAlone)
         return;
-    waitUntil("the other replica takes all", [&] { return fleet.broker.stream().messages == 0; });
+    waitUntil("the other replica takes all",
+              [&] { return fleet.broker.stream().isComplete && fleet.broker.stream().waiting == 0; });
     server.start();
 }
 
