@@ -19,6 +19,7 @@ namespace {
 using kesto_uplink::State;
 
 constexpr std::chrono::seconds patience{180}; // also where other tests run beside this one, under a sanitizer
+constexpr std::chrono::seconds waitToHear{10};
 
 kesto_uplink::UplinkConfiguration configurationOfAll()
 {
@@ -193,11 +194,18 @@ void Device::sendAll(std::chrono::milliseconds waitForConfirmation)
 
 void Device::sendAllAndHear()
 {
-    const auto hasHeard = [this] {
-        State state = State::open(this->state(), now());
-        return isAllSent() && state.queued() == state.stored();
-    };
-    sendUntil(hasHeard, std::chrono::seconds(2));
+    const auto end = std::chrono::steady_clock::now() + patience;
+    for (sendAll(waitToHear); !hasHeard(); sendAll(waitToHear)) {
+        if (std::chrono::steady_clock::now() > end)
+            throw std::runtime_error(directory_.native() + " does not hear that its rows are stored");
+        live(1);
+    }
+}
+
+bool Device::hasHeard()
+{
+    State state = State::open(this->state(), now());
+    return isAllSent() && state.queued() == state.stored();
 }
 
 bool Device::isAllSent()

@@ -46,7 +46,7 @@ public:
     kesto_uplink::RoundResult round(std::chrono::milliseconds waitForConfirmation = std::chrono::seconds(2));
     // Rounds, until the stream has all that may leave. Throws if that takes too long.
     void sendAll(std::chrono::milliseconds waitForConfirmation = std::chrono::seconds(2));
-    // The same, and until the device has heard that all is stored. A device without news does not ask.
+    // The same, and until the device has heard that all is stored. A device without news does not ask, so it gets some.
     void sendAllAndHear();
     [[nodiscard]] bool isAllSent();
 
@@ -58,6 +58,7 @@ public:
 private:
     [[nodiscard]] double now() const;
     void noteChapter(const std::string& pseudonym, std::int64_t before);
+    [[nodiscard]] bool hasHeard();
     void sendUntil(const std::function<bool()>& isDone, std::chrono::milliseconds waitForConfirmation);
 
     const std::filesystem::path directory_;
