@@ -137,6 +137,7 @@ State::State(fs::path file) : file_(std::move(file))
         throw failure(connection.error());
     connection_ = std::move(*connection);
     run("PRAGMA secure_delete = ON");
+    run("PRAGMA cache_size = -256"); // KiB, as in the store: rows are read once
 }
 
 bool State::isEmpty()
