@@ -218,7 +218,9 @@ TEST(ReportOfAService, CountsWhatRunsUpToNowAndWhatWasKilledUpToItsLastWord)
     EXPECT_THAT(print({"--csv", "--by", "device"}), MatchesRegex("device,.*\nnull-sink,[0-9]+\\.[0-9]+,1,1,0.5\n"));
     kestod.kill();
     const std::string first = print({"--json"});
-    EXPECT_THAT(first, AllOf(HasSubstr(R"("running":0,"vanished":0,)"), HasSubstr(R"("application":"tone-player")")));
+    EXPECT_THAT(first,
+                AllOf(HasSubstr(R"("vanished":0,"sessions_with_faults":1,)"),
+                      HasSubstr(R"("running":0,"overlapping":false)"), HasSubstr(R"("application":"tone-player")")));
     const auto secondsIn = [](const std::string& json) { return json.substr(json.rfind("\"seconds\"")); };
     EXPECT_EQ(secondsIn(print({"--json"})), secondsIn(first)) << "it does not grow any more";
 }
