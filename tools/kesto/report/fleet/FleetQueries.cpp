@@ -18,10 +18,12 @@ namespace {
 constexpr std::string_view unitHash = "cityHash64(device)";
 constexpr std::string_view storeHash = "cityHash64(device, epoch)";
 constexpr std::string_view sessionHash = "cityHash64(epoch, session)";
-// As of a piece of a stretch of the device's own report.
-constexpr std::string_view figures = "sum(us), sumIf(us, v = 0), sumIf(us, v < 0),"
-                                     " sum(toInt64(round(us * (greatest(v, 0) / 1000000))))";
-constexpr std::string_view faultsAnHour = "3600000000 * faults / played";
+// As of a piece of a stretch of the device's own report, in the same whole numbers.
+constexpr std::string_view volumeSum = "sum(intDiv(us, 1000000) * greatest(v, 0)"
+                                       " + intDiv(us % 1000000 * greatest(v, 0) + 500000, 1000000))";
+const std::string figures = fmt::format("sum(us), sumIf(us, v = 0), sumIf(us, v < 0), {}", volumeSum);
+// As Played::faultsAnHour works it out.
+constexpr std::string_view faultsAnHour = "faults * 3600 / (played / 1000000)";
 constexpr double microsecondsAnHour = 3'600'000'000;
 constexpr std::int64_t microsecondsADay = 86'400'000'000;
 
@@ -365,11 +367,11 @@ std::string FleetQueries::all() const
         " sum(volume1) AS volume, sum(faults1) AS faults, sum(sessions1) AS sessions, sum(vanished1) AS vanished,"
         " sum(rows1) AS counted, sum(different1) AS different FROM (SELECT any(u) AS u1, sum(us) AS played1,"
         " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS untold1,"
-        " sum(toInt64(round(us * (greatest(v, 0) / 1000000)))) AS volume1, sum(f) AS faults1,"
+        " {} AS volume1, sum(f) AS faults1,"
         " uniqExactIf(n, f = 0) AS sessions1, uniqExactIf(n, gone) AS vanished1, countIf(f = 0) AS rows1,"
         " uniqExactIf(toUInt32(r), f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
         distribution("played", "sessions > 0"), floor, distribution(faultsAnHour, floor), mostNamed + 1, faultsAnHour,
-        floor, rows("", false));
+        floor, volumeSum, rows("", false));
 }
 
 std::string FleetQueries::sums(std::string_view by) const
