@@ -111,6 +111,7 @@ public:
             throw std::runtime_error(fmt::format("the tables in the database {} are of edition {}, and this program "
                                                  "reads edition {}: update the older of the two",
                                                  configuration_.database, *edition, fleet_database::tablesEdition));
+        limitTime();
     }
 
     template <typename Read> void ask(const std::string& query, Read read)
@@ -119,6 +120,10 @@ public:
             servers_.ask("", query + " FORMAT JSONCompact", [](const Answer& each) { return each.status != 0; });
         if (!answer.isGood())
             throw failure(answer.text);
+        if (answer.isCut)
+            throw std::runtime_error(fmt::format("the database answers with more than {} bytes: ask for a shorter "
+                                                 "span, or for less by --application, --device or --unit",
+                                                 longestAnswer));
         const auto parsed = parseJson(answer.text);
         const auto whole = parsed ? parsed->dictionary() : std::nullopt;
         const Value* const data = whole ? whole->find("data") : nullptr;
@@ -133,8 +138,19 @@ public:
     }
 
 private:
+    // Of the server, too, which else goes on when nobody waits any more. Who may only read may not say so.
+    void limitTime()
+    {
+        constexpr std::string_view mayOnlyRead = "1";
+        ask("SELECT value FROM system.settings WHERE name = 'readonly'", [this](Cells& row) {
+            if (row.text() != mayOnlyRead)
+                servers_.set("max_execution_time", std::to_string(configuration_.timeLimit.count()));
+        });
+    }
+
     [[nodiscard]] std::runtime_error failure(const std::string& text) const
     {
+        constexpr int tookTooLong = 159;
         constexpr int wrongPassword = 193;
         constexpr int requiredPassword = 194;
         constexpr int unknownUser = 192;
@@ -146,10 +162,13 @@ private:
                 fmt::format("the database does not let the user {} in: name a file with another user and password by "
                             "--credentials ({})",
                             configuration_.user.empty() ? "default" : configuration_.user, text));
+        case tookTooLong:
         case 0:
             return std::runtime_error(
                 fmt::format("the database of the fleet cannot be asked: {}{}", text,
-                            text.contains("timed out") ? ". --time-limit gives it more time" : ""));
+                            text.contains("timed out") || fleet_database::exceptionCode(text) == tookTooLong
+                                ? ". --time-limit gives it more time"
+                                : ""));
         default: return std::runtime_error("the database of the fleet refuses a question: " + text);
         }
     }
