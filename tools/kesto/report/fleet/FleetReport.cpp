@@ -234,11 +234,12 @@ public:
         if (!recordings.empty() && !report_.isRecording)
             recordings = readSessions(queries_.onlyRecordings(recordings));
         queries_.setRecordings(recordings);
-        std::vector<std::string> doubled = readAll();
-        if (!doubled.empty()) {
-            queries_.setDoubled(doubled);
+        const HistoryQuestion& asked = question_.history;
+        const bool isOfAllRows = asked.applications == "*" && asked.devices == "*";
+        const std::vector<std::string> doubled = isOfAllRows ? readAll() : readDoubled();
+        queries_.setDoubled(doubled);
+        if (!isOfAllRows || !doubled.empty())
             readAll();
-        }
         for (const ReportBy by : parts_.tables)
             readTable(by);
         if (parts_.withDaysOfLines)
@@ -261,6 +262,13 @@ private:
             sessions.push_back({std::move(store), row.text()});
         });
         return sessions;
+    }
+
+    std::vector<std::string> readDoubled()
+    {
+        std::vector<std::string> doubled;
+        database_.ask(queries_.doubled(), [&](Cells& row) { doubled.push_back(row.text()); });
+        return doubled;
     }
 
     // The units of which the database has rows twice: the figures are then wrong.
@@ -307,7 +315,10 @@ private:
         std::unordered_map<std::string, std::size_t> places; // by hash
         database_.ask(queries_.sums(columnOf(by)), [&](Cells& row) {
             std::string key = row.text();
-            places[row.text()] = lines.size();
+            const std::string hash = row.text();
+            if (parts_.withDaysOfLines)
+                hashes_[key] = hash;
+            places[hash] = lines.size();
             lines.push_back({.key = std::move(key), .sum = row.sum(), .overUnits = {}});
         });
         if (!parts_.withOverUnits)
@@ -339,18 +350,18 @@ private:
     // Of the first lines of a table.
     template <typename Keep> void readDaysOf(ReportBy by, const std::vector<ReportLine>& lines, Keep keep)
     {
-        std::map<std::string, std::size_t> ranks;
-        std::vector<std::string> keys;
+        std::map<std::string, std::size_t> ranks; // by hash
+        std::vector<std::string> hashes;
         for (const ReportLine& line : lines) {
-            if (keys.size() == Report::mostInDays)
+            if (hashes.size() == Report::mostInDays)
                 break;
-            ranks[line.key] = keys.size();
-            keys.push_back(line.key);
+            hashes.push_back(hashes_[line.key]);
+            ranks[hashes.back()] = hashes.size() - 1;
         }
-        if (keys.empty())
+        if (hashes.empty())
             return;
-        database_.ask(queries_.daysOf(columnOf(by), keys), [&](Cells& row) {
-            const std::string key = row.text(); // the number of the day, a blank, and the line's key
+        database_.ask(queries_.daysOf(columnOf(by), hashes), [&](Cells& row) {
+            const std::string key = row.text(); // the number of the day, a blank, and the hash of the line's key
             static_cast<void>(row.text());
             const std::size_t blank = key.find(' ');
             const auto day = static_cast<std::size_t>(std::stoull("0" + key.substr(0, blank)));
@@ -494,6 +505,7 @@ private:
     Report report_;
     FleetDatabase database_;
     FleetQueries queries_;
+    std::map<std::string, std::string> hashes_; // by the key of a line
     std::vector<std::string> worstUnits_; // hashes
     std::map<std::string, std::pair<std::string, std::string>> labels_; // model and version by unit
 };
