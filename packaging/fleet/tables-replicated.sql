@@ -34,8 +34,8 @@ CREATE TABLE IF NOT EXISTS kesto.events_local ON CLUSTER fleet (
     model String, -- of the device
     version String, -- the device's release
     payload String, -- JSON without spaces
-    audio_device String DEFAULT visitParamExtractString(payload, 'active_devices'),
-    late_cycles Float64 DEFAULT visitParamExtractFloat(payload, 'late_cycles'),
+    audio_device String, -- the payload's active_devices, up to 256 bytes
+    late_cycles Float64, -- the payload's
     received DateTime DEFAULT now() -- when it was stored here
 ) ENGINE = ReplicatedReplacingMergeTree('/clickhouse/tables/{shard}/kesto/events', '{replica}')
 PARTITION BY toMonday(toDateTime(intDiv(happened_us, 1000000)))

@@ -26,14 +26,16 @@ std::string firstLine(std::string_view text)
 
 // What libcurl reads, up to a length.
 struct Kept {
-    std::string* text;
+    Answer* answer;
     std::size_t longest;
 };
 
 std::size_t keep(char* bytes, std::size_t, std::size_t count, void* kept) noexcept
 {
-    const auto& [text, longest] = *static_cast<Kept*>(kept);
-    text->append(bytes, std::min(count, longest - std::min(longest, text->size())));
+    const auto& [answer, longest] = *static_cast<Kept*>(kept);
+    const std::size_t left = longest - std::min(longest, answer->text.size());
+    answer->isCut |= count > left;
+    answer->text.append(bytes, std::min(count, left));
     return count;
 }
 
@@ -83,7 +85,7 @@ Answer ClickHouseServers::askServer(const std::string& server, const std::string
     for (const auto& [name, value] : configuration_.settings)
         address += fmt::format("&{}={}", connection_->escaped(name), connection_->escaped(value));
     Answer answer;
-    Kept kept{&answer.text, longestAnswer_};
+    Kept kept{&answer, longestAnswer_};
     std::array<char, CURL_ERROR_SIZE> error{};
     CURL* const handle = connection_->handle;
     curl_easy_reset(handle); // keeps the connections

@@ -34,6 +34,7 @@ struct ClickHouseConfiguration {
 struct Answer {
     long status = 0; // of HTTP; 0: there was none
     std::string text; // the body; if the status is not 200, what a person can do something with
+    bool isCut = false; // the body was longer
 
     [[nodiscard]] bool isGood() const noexcept { return status == 200; }
 };
@@ -54,6 +55,8 @@ public:
     // one cannot be used, until each was tried; but an answer that `isFinal` would be the same everywhere.
     [[nodiscard]] Answer ask(const std::string& query, std::string_view body,
                              const std::function<bool(const Answer&)>& isFinal);
+    // Of each question from now on.
+    void set(const std::string& setting, const std::string& value) { configuration_.settings[setting] = value; }
     // Of the tables, 0 if there are none; the error is for a person.
     [[nodiscard]] std::expected<std::uint64_t, std::string> edition();
 

@@ -3,6 +3,7 @@
 #include "kesto-ingest/batch/Batch.h"
 
 #include "foundation/values/Microseconds.h"
+#include "foundation/values/String.h"
 #include "kesto-ingest/batch/Compression.h"
 #include "kesto-ingest/batch/RowReader.h"
 
@@ -69,6 +70,7 @@ void appendColumn(const Field& field, const RowReader& row, std::string& json)
         appendWhole(foundation::wholeMillionths(std::clamp(row.number(field.key), 0.0, 1.0)), json);
         break;
     case FieldType::Flag: json += entry->kind == ValueKind::True ? '1' : '0'; break;
+    case FieldType::Name: appendText(foundation::cutBetweenCharacters(entry->text, longestName), json); break;
     case FieldType::Digits:
     case FieldType::Label:
     case FieldType::Text:

@@ -19,6 +19,7 @@
 #include <optional>
 #include <span>
 #include <system_error>
+#include <utility>
 
 namespace kesto_ingest {
 
@@ -40,25 +41,34 @@ public:
 
     [[nodiscard]] const std::string& reason() const noexcept { return reason_; }
 
-    bool Null() { return isInside() ? writer_.Null() : set(ValueKind::Null, {}); }
+    bool Null()
+    {
+        fact_ = nullptr;
+        return isInside() ? writer_.Null() : set(ValueKind::Null, {});
+    }
     bool Bool(bool value)
     {
+        note(ValueKind::Number, value ? "1" : "0");
         return isInside() ? writer_.Bool(value) : set(value ? ValueKind::True : ValueKind::False, {});
     }
     bool RawNumber(const char* text, rapidjson::SizeType length, bool)
     {
+        note(ValueKind::Number, {text, length});
         return isInside() ? writer_.RawValue(text, length, rapidjson::kNumberType)
                           : set(ValueKind::Number, {text, length});
     }
     bool String(const char* text, rapidjson::SizeType length, bool)
     {
+        note(ValueKind::Text, {text, length});
         return isInside() ? writer_.String(text, length) : set(ValueKind::Text, {text, length});
     }
     bool Key(const char* text, rapidjson::SizeType length, bool)
     {
-        if (isInside())
-            return writer_.Key(text, length);
         const std::string_view key(text, length);
+        if (isInside()) {
+            fact_ = factNamed(key);
+            return writer_.Key(text, length);
+        }
         isIgnored_ = !hasField(key);
         if (isIgnored_)
             return true;
@@ -83,7 +93,43 @@ public:
     static bool Double(double) { return false; }
 
 private:
+    // What the payload tells itself, and not an object inside. Booleans are numbers there, as for SQLite, by which
+    // devices read theirs.
+    struct Fact {
+        std::string_view field;
+        ValueKind kind = ValueKind::Null;
+        std::string text{};
+    };
+
     [[nodiscard]] bool isInside() const noexcept { return depth_ > 1; }
+
+    // Null if it is none, or was told before.
+    Fact* factNamed(std::string_view key)
+    {
+        if (depth_ != 2 || isIgnored_ || entries_[size_ - 1].key != "payload")
+            return nullptr;
+        const auto fact = std::ranges::find_if(facts_, [key](const Fact& each) {
+            return each.field.substr(std::string_view("payload.").size()) == key && each.kind == ValueKind::Null;
+        });
+        return fact == facts_.end() ? nullptr : &*fact;
+    }
+    void note(ValueKind kind, std::string_view text)
+    {
+        if (Fact* const fact = std::exchange(fact_, nullptr)) {
+            fact->kind = kind;
+            fact->text = text;
+        }
+    }
+    // As entries of the row.
+    bool addFacts()
+    {
+        for (Fact& fact : facts_) {
+            if (fact.kind != ValueKind::Null && size_ < entries_.size())
+                entries_[size_++] = {std::string(fact.field), fact.kind, std::move(fact.text)};
+            fact.kind = ValueKind::Null;
+        }
+        return true;
+    }
 
     bool refuse(std::string reason)
     {
@@ -102,6 +148,7 @@ private:
     }
     bool open(ValueKind kind)
     {
+        fact_ = nullptr;
         if (depth_ == 0 && kind != ValueKind::Object)
             return refuse("it is no JSON object");
         if (++depth_ > deepest)
@@ -112,11 +159,16 @@ private:
         }
         return true;
     }
-    bool close(ValueKind kind) { return --depth_ != 1 || set(kind, {buffer_.GetString(), buffer_.GetSize()}); }
+    bool close(ValueKind kind)
+    {
+        return --depth_ != 1 || (set(kind, {buffer_.GetString(), buffer_.GetSize()}) && addFacts());
+    }
 
     std::span<RowEntry> entries_;
     std::size_t& size_;
     unsigned depth_ = 0;
+    std::array<Fact, 2> facts_{{{.field = "payload.active_devices"}, {.field = "payload.late_cycles"}}};
+    Fact* fact_ = nullptr; // whose value comes next
     bool isIgnored_ = false; // the key that was read last, outside of objects and lists
     std::string reason_;
     rapidjson::StringBuffer buffer_;
@@ -159,6 +211,7 @@ std::string_view lacking(const RowEntry& entry, FieldType type)
     case FieldType::Share: return isNumberBetween(entry, -largest, largest) ? "" : "a number";
     case FieldType::Flag: return entry.kind == ValueKind::False || entry.kind == ValueKind::True ? "" : "true or false";
     case FieldType::Label: return isText && entry.text.size() <= longestLabel ? "" : "a text of at most 128 bytes";
+    case FieldType::Name: return isText || entry.kind == ValueKind::Number ? "" : "a text";
     case FieldType::Text: return isText && entry.text.size() <= longestText ? "" : "a text of at most 16384 bytes";
     case FieldType::Object: return entry.kind == ValueKind::Object ? "" : "an object";
     }

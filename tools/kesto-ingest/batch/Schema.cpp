@@ -31,6 +31,8 @@ constexpr Field eventFields[] = {
     {"time", FieldType::Moment, required, "time"},
     {"name", FieldType::Text, required, "name"},
     {"payload", FieldType::Object, required, "payload"},
+    {"payload.active_devices", FieldType::Name, optional, "audio_device"},
+    {"payload.late_cycles", FieldType::Number, optional, "late_cycles"},
     {"session", FieldType::Identity, optional, "session"},
     {"happened", FieldType::Number, optional, "happened"},
     {"application", FieldType::Text, optional, "application"},

@@ -21,6 +21,7 @@ enum class FieldType : std::uint8_t {
     Flag, // a boolean
     Label, // a short text, which stands in every row of a batch
     Text,
+    Name, // a text, or what is told in its place; cut to the length that a device's name has in a report
     Object // JSON
 };
 
@@ -28,7 +29,7 @@ enum class Table : std::uint8_t { Batches, Events, Stretches, Sessions };
 constexpr std::size_t tableCount = 4;
 
 struct Field {
-    std::string_view key;
+    std::string_view key; // "payload.KEY" is one of the payload's own keys
     FieldType type;
     bool isRequired; // if not, a value that does not fit is left out
     std::string_view column; // empty: it is no column
@@ -46,6 +47,7 @@ struct RowKind {
 constexpr std::size_t mostFields = 32; // of all kinds together
 constexpr std::size_t longestLabel = 128;
 constexpr std::size_t longestText = 16 * 1024;
+constexpr std::size_t longestName = 256;
 constexpr double latestMoment = 4'294'967'295; // the end of 32 bits
 
 [[nodiscard]] std::string_view name(Table table) noexcept;

@@ -66,8 +66,8 @@ constexpr Column eventColumns[] = {
     model,
     release,
     {fromRow, "payload", "String", "JSON without spaces"},
-    {workedOut, "audio_device", "String DEFAULT visitParamExtractString(payload, 'active_devices')", ""},
-    {workedOut, "late_cycles", "Float64 DEFAULT visitParamExtractFloat(payload, 'late_cycles')", ""},
+    {fromRow, "audio_device", "String", "the payload's active_devices, up to 256 bytes"},
+    {fromRow, "late_cycles", "Float64", "the payload's"},
     received,
 };
 

@@ -125,7 +125,7 @@ struct Report {
     std::vector<ReportLine> faultKinds; // `played.faults` and `played.sessions` only; the most frequent first
     std::array<double, volumeSteps> secondsAtVolume{}; // not muted: [0] is up to 1/16
     std::vector<WorstSession> worst; // by missed cycles, then by faults
-    std::optional<FleetPart> fleet = {}; // then `running`, `isOverlapping` and what days have by device are not known
+    std::optional<FleetPart> fleet = {}; // then `running` and `isOverlapping` are not known
 };
 
 // Where days begin.

@@ -190,7 +190,7 @@ private:
         Table table("DAY", {{"PLAYED", 7}});
         bool hasSound = areNamed;
         for (const ReportDay& day : report_.days) {
-            hasSound |= day.played.sessions != 0;
+            hasSound |= day.played.sessions != 0 || day.played.seconds > 0; // a fleet's days may tell no sessions
             if (hasSound)
                 table.add({areNamed ? dayName(day.date) : dateText(day.date),
                            {durationText(day.played.seconds)},

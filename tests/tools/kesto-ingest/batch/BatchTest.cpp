@@ -52,6 +52,25 @@ TEST(Batch, TellsWhoseItIs)
     EXPECT_THAT(batch.badRows, IsEmpty());
 }
 
+// As the report of the device itself finds them.
+TEST(Batch, TellsDevicesAndCyclesOfAPayloadItself)
+{
+    const auto factsOf = [](std::string_view payload) {
+        const std::string json = batchOf(deviceLine(3, 9) + eventLine(3, deviceA, payload)).rows.at(1).json;
+        const std::size_t begins = json.find("\",\"", json.find("\"payload\":")) + 2;
+        return json.substr(begins, json.find("\"session\"") - begins);
+    };
+    EXPECT_EQ(factsOf(R"({"active_devices":"café","late_cycles":3})"), R"("audio_device":"café","late_cycles":3,)");
+    EXPECT_EQ(factsOf(R"({"more":{"active_devices":"inner","late_cycles":9},"list":[{"late_cycles":9}]})"), "");
+    EXPECT_EQ(factsOf(R"({"more":{"late_cycles":9},"late_cycles":2.5})"), R"("late_cycles":2.5,)");
+    EXPECT_EQ(factsOf(R"({"active_devices":5,"late_cycles":true})"), R"("audio_device":"5","late_cycles":1,)");
+    EXPECT_EQ(factsOf(R"({"active_devices":null,"late_cycles":"10-100"})"), "");
+    EXPECT_EQ(factsOf(R"({"active_devices":{},"late_cycles":[9]})"), "");
+    EXPECT_EQ(factsOf(R"({"active_devices":"a","active_devices":"b"})"), R"("audio_device":"a",)");
+    EXPECT_EQ(factsOf(fmt::format(R"({{"active_devices":"{}é"}})", std::string(255, 'x'))),
+              fmt::format(R"("audio_device":"{}",)", std::string(255, 'x')));
+}
+
 TEST(Batch, BecomesRowsWithTheColumnsOfTheirTables)
 {
     const Batch batch = batchOf(deviceLine(3, 9) + eventLine(3) + stretchLine(4) + sessionLine(7, "1795264600.125"));
@@ -63,11 +82,12 @@ TEST(Batch, BecomesRowsWithTheColumnsOfTheirTables)
         R"("version":"1.2","sent":1795264600.5,"first_id":3,"last_id":9})"
         "\n");
     EXPECT_EQ(batch.rows[1].table, Table::Events);
-    EXPECT_EQ(batch.rows[1].json,
-              R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":3,)"
-              R"("time":1795264505.66,"name":"com.quarn.kesto.Error.IssueDetector","payload":"{\"late_cycles\":3}",)"
-              R"("session":7,"application":"player","happened_us":1795264505660000,"model":"lamp","version":"1.2"})"
-              "\n");
+    EXPECT_EQ(
+        batch.rows[1].json,
+        R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":3,)"
+        R"("time":1795264505.66,"name":"com.quarn.kesto.Error.IssueDetector","payload":"{\"late_cycles\":3}",)"
+        R"("late_cycles":3,"session":7,"application":"player","happened_us":1795264505660000,"model":"lamp","version":"1.2"})"
+        "\n");
     EXPECT_EQ(batch.rows[2].table, Table::Stretches);
     EXPECT_EQ(batch.rows[2].json,
               R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":4,)"

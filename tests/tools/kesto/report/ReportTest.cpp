@@ -93,6 +93,13 @@ TEST(ReportOfHistory, HasEveryDayOfAnEmptySpan)
     EXPECT_THAT(report.applications, IsEmpty());
 }
 
+// 10.000001 s at half the slider are 5.0000005 s, and count as 5.000001 s.
+TEST(ReportOfHistory, RoundsUpHalfAMicrosecondOfVolume)
+{
+    EXPECT_EQ(reportOf(historyOf({stretch(1, 86'000, 10.000001)})).all.volumeSeconds, 5.000001);
+    EXPECT_EQ(reportOf(historyOf({stretch(1, 86'000, 10.000003)})).all.volumeSeconds, 5.000002);
+}
+
 TEST(ReportOfHistory, DividesAStretchAmongTheDays)
 {
     const Report report = reportOf(historyOf({stretch(1, 86'000, 87'200)}), {.from = 0, .until = 259'200});

@@ -1,41 +1,65 @@
 // SPDX-License-Identifier: Apache-2.0
-// How late days begin changes twice a year, so that a table of these changes is short, however long the span is.
+// The last day of a run may be longer than 24 hours; a moment in its last hour is still in that day.
 #include "kesto/report/fleet/DayTable.h"
 
 #include <fmt/format.h>
+#include <fmt/ranges.h>
 
 namespace {
 
 constexpr std::int64_t microsecondsADay = 86'400'000'000;
 
+// The number of the run in which a figure is, by what each run begins with. Few runs are compared one by one, which is
+// quicker.
+std::string runOf(std::string_view figure, const std::vector<std::int64_t>& beginnings, std::string_view name)
+{
+    constexpr std::size_t few = 8;
+    if (beginnings.size() > few)
+        return fmt::format("arrayCount(x -> x <= {}, {})", figure, name);
+    std::string sum;
+    for (const std::int64_t beginning : beginnings)
+        sum += fmt::format("{}({} >= {})", sum.empty() ? "" : " + ", figure, beginning);
+    return fmt::format("({})", sum);
+}
+
 } // namespace
 
 DayTable::DayTable(const std::vector<std::int64_t>& days)
-    : first_(days[1] - microsecondsADay),
-      last_(static_cast<std::int64_t>(days.size()) - 2)
 {
-    for (std::int64_t day = 1; day <= last_; ++day) {
-        const std::int64_t late = days[static_cast<std::size_t>(day)] - first_ - day * microsecondsADay;
-        if (late != (late_.empty() ? 0 : late_.back().second))
-            late_.emplace_back(day, late);
+    const auto count = static_cast<std::int64_t>(days.size()) - 1;
+    for (std::int64_t day = 0; day <= count; ++day) {
+        const std::int64_t moment = days[static_cast<std::size_t>(day)];
+        const bool goesOn =
+            day != 0 && day != count && moment == moments_.back() + (day - firsts_.back()) * microsecondsADay;
+        if (goesOn)
+            continue;
+        if (day != 0)
+            lasts_.push_back(day - 1);
+        moments_.push_back(moment);
+        firsts_.push_back(day);
     }
+    lasts_.push_back(count - 1);
 }
 
+std::string DayTable::with() const
+{
+    const auto list = [](const std::vector<std::int64_t>& numbers, std::string_view name) {
+        return fmt::format("CAST([{}] AS Array(Int64)) AS {}", fmt::join(numbers, ","), name);
+    };
+    return fmt::format("WITH {}, {}, {} ", list(moments_, "run_moments"), list(firsts_, "run_firsts"),
+                       list(lasts_, "run_lasts"));
+}
+
+// Divided by a signed number: the server divides by an unsigned one as if both were.
 std::string DayTable::of(std::string_view moment, std::string_view name) const
 {
-    const std::string guess = fmt::format("{}_guess", name);
-    const std::string day =
-        fmt::format("(intDiv(greatest({0} - {1}, 0), {2}) AS {3}) + ({0} >= {4}) - ({0} < {5})", moment, first_,
-                    microsecondsADay, guess, beginning(fmt::format("({} + 1)", guess)), beginning(guess));
-    return fmt::format("toInt64(least(greatest({}, 0), {})) AS {}", day, last_, name);
+    return fmt::format("least(run_firsts[{0} AS {1}_run] + intDiv({2} - run_moments[{1}_run], toInt64({3})),"
+                       " run_lasts[{1}_run]) AS {1}",
+                       runOf(moment, moments_, "run_moments"), name, moment, microsecondsADay);
 }
 
 std::string DayTable::beginning(std::string_view day) const
 {
-    std::string late;
-    for (std::size_t place = 0; place < late_.size(); ++place)
-        late += fmt::format("{} < {}, {}, ", day, late_[place].first, place == 0 ? 0 : late_[place - 1].second);
-    if (!late_.empty())
-        late = fmt::format(" + multiIf({}{})", late, late_.back().second);
-    return fmt::format("({} + {} * {}{})", first_, day, microsecondsADay, late);
+    const std::string run = runOf(day, firsts_, "run_firsts");
+    return fmt::format("(run_moments[{0}] + ({1} - run_firsts[{0}]) * {2})", run, day, microsecondsADay);
 }

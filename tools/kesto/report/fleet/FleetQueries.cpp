@@ -3,7 +3,8 @@
 // the numbers of session and row in the device's store. us is how long in microseconds, v the volume in millionths or
 // -1, and f is 1 of a fault. Sums are of whole numbers.
 //
-// A subquery of a distributed table in another's condition is GLOBAL: the first server asks it once for all.
+// Tables may be distributed over servers. There, a subquery in a condition is GLOBAL: the first server asks it once for
+// all. A list of constants must not be, and constants of one part of a UNION are columns of it by materialize().
 #include "kesto/report/fleet/FleetQueries.h"
 
 #include "foundation/values/Microseconds.h"
@@ -11,6 +12,7 @@
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
+#include <set>
 #include <utility>
 
 namespace {
@@ -18,12 +20,22 @@ namespace {
 constexpr std::string_view unitHash = "cityHash64(device)";
 constexpr std::string_view storeHash = "cityHash64(device, epoch)";
 constexpr std::string_view sessionHash = "cityHash64(epoch, session)";
-// As of a piece of a stretch of the device's own report.
-constexpr std::string_view figures = "sum(us), sumIf(us, v = 0), sumIf(us, v < 0),"
-                                     " sum(toInt64(round(us * (greatest(v, 0) / 1000000))))";
-constexpr std::string_view faultsAnHour = "3600000000 * faults / played";
+// As of a piece of a stretch of the device's own report, in the same whole numbers.
+constexpr std::string_view volumeSum = "sum(intDiv(us, 1000000) * greatest(v, 0)"
+                                       " + intDiv(us % 1000000 * greatest(v, 0) + 500000, 1000000))";
+const std::string figures = fmt::format("sum(us), sumIf(us, v = 0), sumIf(us, v < 0), {}", volumeSum);
+// As Played::faultsAnHour works it out.
+constexpr std::string_view faultsAnHour = "faults * 3600 / (played / 1000000)";
 constexpr double microsecondsAnHour = 3'600'000'000;
 constexpr std::int64_t microsecondsADay = 86'400'000'000;
+constexpr std::uint64_t partsOfHashes = 1'000'003;
+// Of rows that the database has several times, it keeps the last. What else differs makes the choice the same for all
+// queries if they came in one second.
+constexpr std::string_view lastOfEvent = "ORDER BY received DESC, cityHash64(application, audio_device, model, version,"
+                                         " late_cycles) LIMIT 1 BY device, epoch, id";
+constexpr std::string_view lastOfStretch =
+    "ORDER BY received DESC, cityHash64(application, audio_device, format, ifNull(toInt64(volume_millionths), -1),"
+    " model, version, ending) LIMIT 1 BY device, epoch, id";
 
 // A character behind a backslash stands for itself.
 void appendLiteral(char character, std::string& expression)
@@ -130,10 +142,14 @@ std::string FleetQueries::present()
     return "SELECT toUInt32(now()) + 1";
 }
 
+// By a part of their hashes: the queries stay short, and to choose one row of each does no harm to other units.
 void FleetQueries::setDoubled(const std::vector<std::string>& units)
 {
-    areManyDoubled_ = units.size() > mostNamed;
-    doubled_ = areManyDoubled_ ? "" : fmt::format("{}", fmt::join(units, ","));
+    areManyDoubled_ = units.size() > mostUnits;
+    std::set<std::uint64_t> parts;
+    for (const std::string& unit : units)
+        parts.insert(std::stoull("0" + unit) % partsOfHashes);
+    doubled_ = areManyDoubled_ ? "" : fmt::format("{}", fmt::join(parts, ","));
 }
 
 // --- Conditions
@@ -151,8 +167,9 @@ std::string FleetQueries::touching(bool isWide) const
     const std::int64_t from = from_ - (isWide ? rounding : 0);
     const std::int64_t until = until_ + (isWide ? rounding : 0);
     return fmt::format("began_us < {} AND began_us + microseconds > {} AND (began_us > {} OR microseconds > {})"
-                       " AND received < toDateTime({}){}",
-                       until, from, from - microsecondsADay - 1, microsecondsADay, present_, unitCondition());
+                       " AND received < toDateTime({}){}{}",
+                       until, from, from - microsecondsADay - 1, microsecondsADay, present_,
+                       isWide ? "" : " AND microseconds > 0", unitCondition());
 }
 
 namespace {
@@ -171,14 +188,15 @@ std::string matching(std::string_view column, const std::string& glob)
 std::string FleetQueries::faults(bool withDevices) const
 {
     const HistoryQuestion& asked = question_.history;
-    std::string each =
-        fmt::format("SELECT {} AS u, {} AS st, {} AS s, device AS unit, epoch, session, happened_us AS happened,"
-                    " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
-                    " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM events"
-                    " WHERE name LIKE 'com.quarn.kesto.Error.%' AND happened_us >= {} AND happened_us < {}"
-                    " AND received < toDateTime({}){}{}{} LIMIT 1 BY device, epoch, id",
-                    unitHash, storeHash, sessionHash, std::string_view("com.quarn.kesto.Error.").size() + 1, from_,
-                    until_, present_, unitCondition(), matching("application", asked.applications), direction_);
+    std::string each = fmt::format(
+        "SELECT {} AS u, {} AS st, {} AS s, device AS unit, epoch, session, happened_us AS happened,"
+        " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
+        " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM (SELECT device, epoch, id,"
+        " session, happened_us, name, application, audio_device, model, version, late_cycles FROM events"
+        " WHERE name LIKE 'com.quarn.kesto.Error.%' AND happened_us >= {} AND happened_us < {}"
+        " AND received < toDateTime({}){} {}) WHERE 1{}{}",
+        unitHash, storeHash, sessionHash, std::string_view("com.quarn.kesto.Error.").size() + 1, from_, until_,
+        present_, unitCondition(), lastOfEvent, matching("application", asked.applications), direction_);
     if (!withDevices)
         return each;
     // A fault without a device is on that on which its session played then; in between, before it.
@@ -207,26 +225,26 @@ std::string FleetQueries::recordings() const
 {
     return fmt::format("SELECT toString({} AS st), toString(session) FROM stretches WHERE recording = 1 AND {}"
                        " AND (st, session) GLOBAL IN ({}) GROUP BY st, session LIMIT {}",
-                       storeHash, touching(true), sessionsWithFault(false), mostNamed + 1);
+                       storeHash, touching(true), sessionsWithFault(false), mostSessions + 1);
 }
 
-std::string FleetQueries::listOf(const std::vector<FleetSession>& recordings) const
+std::string FleetQueries::amongRecordings(const std::vector<FleetSession>& recordings) const
 {
-    if (recordings.size() > mostNamed)
-        return fmt::format("SELECT {} AS st, session FROM stretches WHERE recording = 1 AND {}", storeHash,
+    if (recordings.size() > mostSessions)
+        return fmt::format("GLOBAL IN (SELECT {} AS st, session FROM stretches WHERE recording = 1 AND {})", storeHash,
                            touching(true));
     std::string list;
     for (const FleetSession& each : recordings)
         list += fmt::format("{}({},{})", list.empty() ? "" : ",", each.store, each.session);
-    return list;
+    return fmt::format("IN ({})", list);
 }
 
 std::string FleetQueries::onlyRecordings(const std::vector<FleetSession>& recordings) const
 {
-    return fmt::format(
-        "SELECT toString({} AS st), toString(session) FROM stretches WHERE {} AND (st, session) GLOBAL IN"
-        " ({}) AND (st, session) GLOBAL IN ({}) GROUP BY st, session HAVING min(recording) = 1 LIMIT {}",
-        storeHash, touching(true), listOf(recordings), sessionsWithFault(false), mostNamed + 1);
+    return fmt::format("SELECT toString({} AS st), toString(session) FROM stretches WHERE {} AND (st, session) {}"
+                       " AND (st, session) GLOBAL IN ({}) GROUP BY st, session HAVING min(recording) = 1 LIMIT {}",
+                       storeHash, touching(true), amongRecordings(recordings), sessionsWithFault(false),
+                       mostSessions + 1);
 }
 
 void FleetQueries::setRecordings(const std::vector<FleetSession>& sessions)
@@ -235,12 +253,12 @@ void FleetQueries::setRecordings(const std::vector<FleetSession>& sessions)
     direction_ = isRecording ? " AND 0" : "";
     if (sessions.empty())
         return;
-    std::string list = listOf(sessions);
-    if (sessions.size() > mostNamed && !isRecording)
-        list = fmt::format("SELECT {} AS st, session FROM stretches WHERE {} AND (st, session) GLOBAL IN ({})"
-                           " GROUP BY st, session HAVING min(recording) = 1",
-                           storeHash, touching(true), list);
-    direction_ = fmt::format(" AND ({}, session) GLOBAL {} ({})", storeHash, isRecording ? "IN" : "NOT IN", list);
+    std::string among = amongRecordings(sessions);
+    if (sessions.size() > mostSessions && !isRecording)
+        among = fmt::format("GLOBAL IN (SELECT {} AS st, session FROM stretches WHERE {} AND (st, session) {}"
+                            " GROUP BY st, session HAVING min(recording) = 1)",
+                            storeHash, touching(true), among);
+    direction_ = fmt::format(" AND {}(({}, session) {})", isRecording ? "" : "NOT ", storeHash, among);
 }
 
 // --- Rows
@@ -250,30 +268,39 @@ bool FleetQueries::needsDevices(std::string_view by) const
     return by == "audio_device" || by == "format" || question_.history.devices != "*";
 }
 
-// With the columns of a row, and `key` as an expression of the columns of the table and of `begins` and `ends`.
-std::string FleetQueries::stretchRows(std::string_view key, const std::string& condition) const
+// Of a table or a query as it: with the columns of a row, and `key` as an expression of the columns of the table and of
+// `begins` and `ends`.
+std::string FleetQueries::stretchRows(std::string_view table, std::string_view key, const std::string& condition) const
 {
     const HistoryQuestion& asked = question_.history;
     return fmt::format(
-        "SELECT {} AS u, {} AS s, cityHash64(epoch, id) AS i, session AS n, id AS r, greatest(began_us, {}) AS begins,"
-        " least(began_us + microseconds, {}) AS ends, {}, ifNull(toInt64(volume_millionths), -1) AS v,"
-        " toUInt8(ending = 'vanished' AND began_us + microseconds <= {}) AS gone, toUInt64(0) AS f FROM stretches"
+        "SELECT {} AS u, {} AS s, cityHash64(epoch, id) AS i, session AS n, id AS r, toInt64(greatest(began_us, {})) AS"
+        " begins, least(began_us + microseconds, {}) AS ends, {}, ifNull(toInt64(volume_millionths), -1) AS v,"
+        " toUInt8(ending = 'vanished' AND began_us + microseconds <= {}) AS gone, materialize(toUInt64(0)) AS f FROM {}"
         " WHERE recording = {} AND {}{}{}{}",
-        unitHash, sessionHash, from_, until_, key, until_, asked.isRecording ? 1 : 0, touching(false),
+        unitHash, sessionHash, from_, until_, key, until_, table, asked.isRecording ? 1 : 0, touching(false),
         matching("application", asked.applications), matching("audio_device", asked.devices), condition);
 }
 
-// Each row once, also where the database has it twice.
-std::string FleetQueries::onceEach(std::string_view key, const std::string& condition) const
+// Each row once, also where the database has it several times: of all of them at once as the database merges them, of
+// few units by their hashes. Which row of several stays does not depend on what is asked.
+std::string FleetQueries::onceEach(std::string_view key, const std::string& condition, std::string_view with) const
 {
     constexpr std::string_view columns = "u, s, i, n, r, us, v, gone, f, k";
+    const auto rowsOf = [&](std::string_view table, const std::string& units) {
+        return fmt::format("SELECT {} FROM ({}{})", columns, with, stretchRows(table, key, condition + units));
+    };
     if (areManyDoubled_)
-        return fmt::format("SELECT {} FROM ({} LIMIT 1 BY u, i, k)", columns, stretchRows(key, condition));
+        return rowsOf("stretches FINAL", "");
     if (doubled_.empty())
-        return fmt::format("SELECT {} FROM ({})", columns, stretchRows(key, condition));
-    return fmt::format("SELECT {0} FROM ({1}) UNION ALL SELECT {0} FROM ({2} LIMIT 1 BY u, i, k)", columns,
-                       stretchRows(key, fmt::format("{} AND {} NOT IN ({})", condition, unitHash, doubled_)),
-                       stretchRows(key, fmt::format("{} AND {} IN ({})", condition, unitHash, doubled_)));
+        return rowsOf("stretches", "");
+    const std::string isDoubled = fmt::format("{} % {} IN ({})", unitHash, partsOfHashes, doubled_);
+    const std::string last = fmt::format(
+        "(SELECT device, epoch, id, session, recording, began_us, microseconds, application, audio_device, format,"
+        " volume_millionths, ending, model, version, received FROM stretches WHERE {} AND {} {})",
+        touching(false), isDoubled, lastOfStretch);
+    return fmt::format("{} UNION ALL {}", rowsOf("stretches", fmt::format(" AND NOT ({})", isDoubled)),
+                       rowsOf(last, ""));
 }
 
 namespace {
@@ -281,8 +308,9 @@ namespace {
 // A fault as a row.
 std::string faultRow(std::string_view key, const std::string& faults)
 {
-    return fmt::format("SELECT u, s, toUInt64(0) AS i, session AS n, toUInt64(0) AS r, toInt64(0) AS us,"
-                       " toInt64(-1) AS v, toUInt8(0) AS gone, toUInt64(1) AS f, {} AS k FROM ({})",
+    return fmt::format("SELECT u, s, materialize(toUInt64(0)) AS i, session AS n, materialize(toUInt64(0)) AS r,"
+                       " materialize(toInt64(0)) AS us, materialize(toInt64(-1)) AS v, materialize(toUInt8(0)) AS gone,"
+                       " materialize(toUInt64(1)) AS f, {} AS k FROM ({})",
                        key, faults);
 }
 
@@ -302,8 +330,9 @@ std::string FleetQueries::daysOfStretches(const std::string& key, const std::str
     const std::string parts = fmt::format("{}, first + arrayJoin(range(toUInt64(last - first + 1))) AS day,"
                                           " least(ends, {}) - greatest(begins, {}) AS us, {} AS k",
                                           both, days_.beginning("(day + 1)"), days_.beginning("day"), key);
-    return fmt::format("{} UNION ALL {}", onceEach(whole, condition + " AND first = last"),
-                       onceEach(parts, condition + " AND first != last"));
+    const std::string with = days_.with();
+    return fmt::format("{} UNION ALL {}", onceEach(whole, condition + " AND first = last", with),
+                       onceEach(parts, condition + " AND first != last", with));
 }
 
 std::string FleetQueries::rows(std::string_view by, bool isHashed) const
@@ -313,7 +342,7 @@ std::string FleetQueries::rows(std::string_view by, bool isHashed) const
     };
     const std::string all = faults(needsDevices(by));
     if (by == "day")
-        return fmt::format("{} UNION ALL {}", daysOfStretches(hashed("day"), ""),
+        return fmt::format("{} UNION ALL {}{}", daysOfStretches(hashed("day"), ""), days_.with(),
                            faultRow(hashed(fmt::format("({})", days_.of("happened", "day"))), all));
     const bool isByStore = by.empty();
     const std::string ofStretch = isByStore ? std::string(storeHash) : hashed(by);
@@ -321,18 +350,19 @@ std::string FleetQueries::rows(std::string_view by, bool isHashed) const
                        faultRow(isByStore ? "cityHash64(unit, epoch)" : hashed(ofFault(by)), all));
 }
 
-std::string FleetQueries::daysOf(std::string_view by, const std::vector<std::string>& keys) const
+std::string FleetQueries::daysOf(std::string_view by, const std::vector<std::string>& hashes) const
 {
-    std::string list;
-    for (const std::string& key : keys)
-        list += (list.empty() ? "" : ",") + sqlText(key);
-    const std::string ofStretches =
-        daysOfStretches(fmt::format("concat(toString(day), ' ', {})", by), fmt::format(" AND {} IN ({})", by, list));
+    const auto dayAndHash = [](const std::string& day, std::string_view key) {
+        return fmt::format("concat(toString({}), ' ', toString(cityHash64({})))", day, key);
+    };
+    const auto isAmong = [&hashes](std::string_view key) {
+        return fmt::format("cityHash64({}) IN ({})", key, fmt::join(hashes, ","));
+    };
+    const std::string ofStretches = daysOfStretches(dayAndHash("day", by), " AND " + isAmong(by));
     const std::string ofFaults =
-        faultRow(fmt::format("concat(toString({}), ' ', {})", days_.of("happened", "day"), ofFault(by)),
-                 faults(needsDevices(by)));
-    return fmt::format("SELECT k, '', {}, sum(f) FROM ({} UNION ALL {} WHERE {} IN ({})) GROUP BY k", figures,
-                       ofStretches, ofFaults, ofFault(by), list);
+        faultRow(dayAndHash(days_.of("happened", "day"), ofFault(by)), faults(needsDevices(by)));
+    return fmt::format("SELECT k, '', {}, sum(f) FROM ({} UNION ALL {}{} WHERE {}) GROUP BY k", figures, ofStretches,
+                       days_.with(), ofFaults, isAmong(ofFault(by)));
 }
 
 // --- Queries
@@ -365,11 +395,19 @@ std::string FleetQueries::all() const
         " sum(volume1) AS volume, sum(faults1) AS faults, sum(sessions1) AS sessions, sum(vanished1) AS vanished,"
         " sum(rows1) AS counted, sum(different1) AS different FROM (SELECT any(u) AS u1, sum(us) AS played1,"
         " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS untold1,"
-        " sum(toInt64(round(us * (greatest(v, 0) / 1000000)))) AS volume1, sum(f) AS faults1,"
+        " {} AS volume1, sum(f) AS faults1,"
         " uniqExactIf(n, f = 0) AS sessions1, uniqExactIf(n, gone) AS vanished1, countIf(f = 0) AS rows1,"
         " uniqExactIf(toUInt32(r), f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
-        distribution("played", "sessions > 0"), floor, distribution(faultsAnHour, floor), mostNamed + 1, faultsAnHour,
-        floor, rows("", false));
+        distribution("played", "sessions > 0"), floor, distribution(faultsAnHour, floor), mostUnits + 1, faultsAnHour,
+        floor, volumeSum, rows("", false));
+}
+
+std::string FleetQueries::doubled() const
+{
+    return fmt::format("SELECT toString(u1) FROM (SELECT any({}) AS u1, {} AS k, count() AS counted,"
+                       " uniqExact(toUInt32(id)) AS different FROM stretches WHERE recording = {} AND {} GROUP BY k)"
+                       " WHERE counted != different GROUP BY u1 LIMIT {}",
+                       unitHash, storeHash, question_.history.isRecording ? 1 : 0, touching(false), mostUnits + 1);
 }
 
 std::string FleetQueries::sums(std::string_view by) const
@@ -406,21 +444,20 @@ std::string FleetQueries::sessionsThatPlayedWithFaults() const
 {
     return fmt::format("SELECT uniqExact(u, s) FROM ({}) WHERE (u, s) GLOBAL IN (SELECT u, s FROM ({}) WHERE session"
                        " != 0)",
-                       stretchRows("toUInt64(0) AS k", ""), faults(needsDevices("")));
+                       onceEach("ends - begins AS us, toUInt64(0) AS k", ""), faults(needsDevices("")));
 }
 
 std::string FleetQueries::units(const std::vector<std::string>& hashes) const
 {
     const std::string chosen = hashes.empty() ? "" : fmt::format(" AND {} IN ({})", unitHash, fmt::join(hashes, ","));
     const std::string ofFaults = fmt::format(
-        "SELECT unit AS name, s, toInt64(0) AS us, toInt64(-1) AS v, toUInt64(1) AS f, model AS m, version AS r"
-        " FROM ({})"
-        " WHERE 1{}",
+        "SELECT unit AS name, s, materialize(toInt64(0)) AS us, materialize(toInt64(-1)) AS v,"
+        " materialize(toUInt64(1)) AS f, model AS m, version AS r, happened AS moment FROM ({}) WHERE 1{}",
         faults(needsDevices("")), hashes.empty() ? "" : fmt::format(" AND u IN ({})", fmt::join(hashes, ",")));
-    const std::string ofStretches = onceEach("ends - begins AS us, (device, model, version) AS k", chosen);
+    const std::string ofStretches = onceEach("ends - begins AS us, (device, model, version, begins) AS k", chosen);
     return fmt::format(
-        "SELECT name, any(m), any(r), {}, sum(f), uniqExactIf(s, f = 0) FROM (SELECT k.1 AS name, s, us, v,"
-        " f, k.2 AS m, k.3 AS r FROM ({}) UNION ALL {}) GROUP BY name",
+        "SELECT name, argMax(m, moment), argMax(r, moment), {}, sum(f), uniqExactIf(s, f = 0) FROM (SELECT k.1 AS name,"
+        " s, us, v, f, k.2 AS m, k.3 AS r, k.4 AS moment FROM ({}) UNION ALL {}) GROUP BY name",
         figures, ofStretches, ofFaults);
 }
 
@@ -444,10 +481,10 @@ std::string FleetQueries::sessionList(const std::vector<std::vector<std::string>
 std::string FleetQueries::stretchesOf(const std::string& sessions) const
 {
     return fmt::format("SELECT device, epoch, toString(session), began_us, microseconds, audio_device, format,"
-                       " volume_millionths, ending FROM stretches WHERE recording = {} AND {}{}"
-                       " AND (device, epoch, session) IN ({}) ORDER BY began_us LIMIT 1 BY device, epoch, id",
-                       question_.history.isRecording ? 1 : 0, touching(false),
-                       matching("audio_device", question_.history.devices), sessions);
+                       " volume_millionths, ending FROM (SELECT * FROM stretches WHERE recording = {} AND {}"
+                       " AND (device, epoch, session) IN ({}) {}) WHERE 1{} ORDER BY began_us",
+                       question_.history.isRecording ? 1 : 0, touching(false), sessions, lastOfStretch,
+                       matching("audio_device", question_.history.devices));
 }
 
 std::string FleetQueries::sessions(const std::string& sessions)

@@ -26,7 +26,9 @@ struct FleetSession {
 // What the columns of a query are called in the order in which they come stands at each function.
 class FleetQueries {
 public:
-    static constexpr std::size_t mostNamed = 4000; // of units or sessions that a query names one by one
+    // That a query names one by one: some name a list several times, and the database reads 262,144 bytes.
+    static constexpr std::size_t mostUnits = 3000;
+    static constexpr std::size_t mostSessions = 1000;
 
     // `days`: when each day of the span begins, and when the last ends.
     FleetQueries(FleetQuestion question, const std::vector<std::int64_t>& days);
@@ -42,6 +44,8 @@ public:
     // Those that recorded, in a report of recordings; in another, those that did not play. Without any, no fault is one
     // of recording.
     void setRecordings(const std::vector<FleetSession>& sessions);
+    // units with doubled rows, also of rows that do not match: what differs may be why one of them does.
+    [[nodiscard]] std::string doubled() const;
     void setDoubled(const std::vector<std::string>& units);
 
     // microseconds, muted, without volume, volume, faults, sessions, vanished, units; median, 90 % and most of the
@@ -50,8 +54,9 @@ public:
     [[nodiscard]] std::string all() const;
     // key, hash of the key, microseconds, muted, without volume, volume, faults. `by` is a column, or "day".
     [[nodiscard]] std::string sums(std::string_view by) const;
-    // day and key with a blank between, hash, microseconds, muted, without volume, volume, faults: of those keys.
-    [[nodiscard]] std::string daysOf(std::string_view by, const std::vector<std::string>& keys) const;
+    // day and hash of the key with a blank between, nothing, microseconds, muted, without volume, volume, faults: of
+    // the keys with those hashes.
+    [[nodiscard]] std::string daysOf(std::string_view by, const std::vector<std::string>& hashes) const;
     // hash of the key, sessions, units; median, 90 % and worst of the faults an hour of those above the floor.
     [[nodiscard]] std::string overUnits(std::string_view by) const;
     // step, microseconds
@@ -61,8 +66,8 @@ public:
     // sessions
     [[nodiscard]] std::string sessionsWithFaults() const;
     [[nodiscard]] std::string sessionsThatPlayedWithFaults() const;
-    // unit, model, version, microseconds, muted, without volume, volume, faults, sessions. Of those hashes, or of all
-    // if there are none.
+    // unit, its last model and version in the span, microseconds, muted, without volume, volume, faults, sessions. Of
+    // those hashes, or of all if there are none.
     [[nodiscard]] std::string units(const std::vector<std::string>& hashes) const;
     // unit, epoch, session, late cycles, faults
     [[nodiscard]] std::string worstSessions() const;
@@ -77,15 +82,17 @@ public:
 
 private:
     [[nodiscard]] bool needsDevices(std::string_view by) const;
-    [[nodiscard]] std::string stretchRows(std::string_view key, const std::string& condition) const;
-    [[nodiscard]] std::string onceEach(std::string_view key, const std::string& condition) const;
+    [[nodiscard]] std::string stretchRows(std::string_view table, std::string_view key,
+                                          const std::string& condition) const;
+    [[nodiscard]] std::string onceEach(std::string_view key, const std::string& condition,
+                                       std::string_view with = {}) const;
     [[nodiscard]] std::string faults(bool withDevices) const;
     [[nodiscard]] std::string rows(std::string_view by, bool isHashed) const;
     [[nodiscard]] std::string daysOfStretches(const std::string& key, const std::string& condition) const;
     [[nodiscard]] std::string touching(bool isWide) const;
     [[nodiscard]] std::string unitCondition() const;
     [[nodiscard]] std::string sessionsWithFault(bool withDirection) const;
-    [[nodiscard]] std::string listOf(const std::vector<FleetSession>& recordings) const;
+    [[nodiscard]] std::string amongRecordings(const std::vector<FleetSession>& recordings) const;
 
     FleetQuestion question_;
     DayTable days_;
@@ -93,7 +100,7 @@ private:
     std::int64_t until_;
     std::string present_ = "now() + 1";
     std::string direction_; // a condition of a fault
-    std::string doubled_; // a list of units; empty: none
+    std::string doubled_; // a list of parts of the hashes of units; empty: none
     bool areManyDoubled_ = false;
 };
 

@@ -111,6 +111,7 @@ public:
             throw std::runtime_error(fmt::format("the tables in the database {} are of edition {}, and this program "
                                                  "reads edition {}: update the older of the two",
                                                  configuration_.database, *edition, fleet_database::tablesEdition));
+        limitTime();
     }
 
     template <typename Read> void ask(const std::string& query, Read read)
@@ -119,6 +120,10 @@ public:
             servers_.ask("", query + " FORMAT JSONCompact", [](const Answer& each) { return each.status != 0; });
         if (!answer.isGood())
             throw failure(answer.text);
+        if (answer.isCut)
+            throw std::runtime_error(fmt::format("the database answers with more than {} bytes: ask for a shorter "
+                                                 "span, or for less by --application, --device or --unit",
+                                                 longestAnswer));
         const auto parsed = parseJson(answer.text);
         const auto whole = parsed ? parsed->dictionary() : std::nullopt;
         const Value* const data = whole ? whole->find("data") : nullptr;
@@ -133,8 +138,19 @@ public:
     }
 
 private:
+    // Of the server, too, which else goes on when nobody waits any more. Who may only read may not say so.
+    void limitTime()
+    {
+        constexpr std::string_view mayOnlyRead = "1";
+        ask("SELECT value FROM system.settings WHERE name = 'readonly'", [this](Cells& row) {
+            if (row.text() != mayOnlyRead)
+                servers_.set("max_execution_time", std::to_string(configuration_.timeLimit.count()));
+        });
+    }
+
     [[nodiscard]] std::runtime_error failure(const std::string& text) const
     {
+        constexpr int tookTooLong = 159;
         constexpr int wrongPassword = 193;
         constexpr int requiredPassword = 194;
         constexpr int unknownUser = 192;
@@ -146,10 +162,13 @@ private:
                 fmt::format("the database does not let the user {} in: name a file with another user and password by "
                             "--credentials ({})",
                             configuration_.user.empty() ? "default" : configuration_.user, text));
+        case tookTooLong:
         case 0:
             return std::runtime_error(
                 fmt::format("the database of the fleet cannot be asked: {}{}", text,
-                            text.contains("timed out") ? ". --time-limit gives it more time" : ""));
+                            text.contains("timed out") || fleet_database::exceptionCode(text) == tookTooLong
+                                ? ". --time-limit gives it more time"
+                                : ""));
         default: return std::runtime_error("the database of the fleet refuses a question: " + text);
         }
     }
@@ -215,11 +234,12 @@ public:
         if (!recordings.empty() && !report_.isRecording)
             recordings = readSessions(queries_.onlyRecordings(recordings));
         queries_.setRecordings(recordings);
-        std::vector<std::string> doubled = readAll();
-        if (!doubled.empty()) {
-            queries_.setDoubled(doubled);
+        const HistoryQuestion& asked = question_.history;
+        const bool isOfAllRows = asked.applications == "*" && asked.devices == "*";
+        const std::vector<std::string> doubled = isOfAllRows ? readAll() : readDoubled();
+        queries_.setDoubled(doubled);
+        if (!isOfAllRows || !doubled.empty())
             readAll();
-        }
         for (const ReportBy by : parts_.tables)
             readTable(by);
         if (parts_.withDaysOfLines)
@@ -242,6 +262,13 @@ private:
             sessions.push_back({std::move(store), row.text()});
         });
         return sessions;
+    }
+
+    std::vector<std::string> readDoubled()
+    {
+        std::vector<std::string> doubled;
+        database_.ask(queries_.doubled(), [&](Cells& row) { doubled.push_back(row.text()); });
+        return doubled;
     }
 
     // The units of which the database has rows twice: the figures are then wrong.
@@ -288,7 +315,10 @@ private:
         std::unordered_map<std::string, std::size_t> places; // by hash
         database_.ask(queries_.sums(columnOf(by)), [&](Cells& row) {
             std::string key = row.text();
-            places[row.text()] = lines.size();
+            const std::string hash = row.text();
+            if (parts_.withDaysOfLines)
+                hashes_[key] = hash;
+            places[hash] = lines.size();
             lines.push_back({.key = std::move(key), .sum = row.sum(), .overUnits = {}});
         });
         if (!parts_.withOverUnits)
@@ -320,18 +350,18 @@ private:
     // Of the first lines of a table.
     template <typename Keep> void readDaysOf(ReportBy by, const std::vector<ReportLine>& lines, Keep keep)
     {
-        std::map<std::string, std::size_t> ranks;
-        std::vector<std::string> keys;
+        std::map<std::string, std::size_t> ranks; // by hash
+        std::vector<std::string> hashes;
         for (const ReportLine& line : lines) {
-            if (keys.size() == Report::mostInDays)
+            if (hashes.size() == Report::mostInDays)
                 break;
-            ranks[line.key] = keys.size();
-            keys.push_back(line.key);
+            hashes.push_back(hashes_[line.key]);
+            ranks[hashes.back()] = hashes.size() - 1;
         }
-        if (keys.empty())
+        if (hashes.empty())
             return;
-        database_.ask(queries_.daysOf(columnOf(by), keys), [&](Cells& row) {
-            const std::string key = row.text(); // the number of the day, a blank, and the line's key
+        database_.ask(queries_.daysOf(columnOf(by), hashes), [&](Cells& row) {
+            const std::string key = row.text(); // the number of the day, a blank, and the hash of the line's key
             static_cast<void>(row.text());
             const std::size_t blank = key.find(' ');
             const auto day = static_cast<std::size_t>(std::stoull("0" + key.substr(0, blank)));
@@ -475,6 +505,7 @@ private:
     Report report_;
     FleetDatabase database_;
     FleetQueries queries_;
+    std::map<std::string, std::string> hashes_; // by the key of a line
     std::vector<std::string> worstUnits_; // hashes
     std::map<std::string, std::pair<std::string, std::string>> labels_; // model and version by unit
 };

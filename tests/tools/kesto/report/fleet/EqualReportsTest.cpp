@@ -60,6 +60,9 @@ protected:
     {
         weeks::Weeks made = weeks::makeWeeks({.seed = seed, .sessions = 300, .midnights = days.midnights});
         std::erase_if(made.stretches, [](const weeks::Stretch& each) { return each.ending == weeks::Ending::None; });
+        for (std::size_t index = 0; index < made.stretches.size(); index += 3)
+            if (made.stretches[index].volume)
+                made.stretches[index].volume = 0.5; // many a length then has no nearest microsecond
         const auto store = directory / name;
         weeks::writeWeeks(made, store);
         return store;

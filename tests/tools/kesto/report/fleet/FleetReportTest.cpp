@@ -4,11 +4,14 @@
 #include "kesto-ingest/MetricsServer.h"
 #include "kesto/report/fleet/FleetQueries.h"
 #include "kesto/store/EventDatabase.h"
+#include "support/KeptPort.h"
 #include "tools/kesto/report/fleet/Fleet.h"
 
+#include <chrono>
 #include <fmt/format.h>
 #include <fmt/ranges.h>
 #include <gmock/gmock.h>
+#include <thread>
 
 namespace kesto_tool {
 namespace {
@@ -200,8 +203,10 @@ TEST_F(FleetReports, FindDaysWhereverTheyBegin)
                                                          {24, 24, 24},
                                                          {24, 23, 24, 24, 25, 24, 1},
                                                          {25, 24},
+                                                         {24, 25},
                                                          {1, 25, 24, 23, 24},
-                                                         {10, 23, 23, 23, 24}};
+                                                         {10, 23, 23, 23, 24},
+                                                         {24, 23, 25, 23, 25, 23, 25, 23, 25, 23, 25}};
     for (const auto& hours : lengths) {
         std::vector<std::int64_t> days{1794787200123456};
         for (const std::int64_t each : hours)
@@ -209,11 +214,39 @@ TEST_F(FleetReports, FindDaysWhereverTheyBegin)
         const DayTable table(days);
         for (std::size_t day = 0; day + 1 < days.size(); ++day)
             for (const std::int64_t moment : {days[day], days[day] + 1, days[day + 1] - 1})
-                EXPECT_EQ(server.select(fmt::format("SELECT {} FROM (SELECT toInt64({}) AS moment)",
-                                                    table.of("moment", "day"), moment)),
-                          fmt::format("{}", day))
+                EXPECT_EQ(server.select(fmt::format("{}SELECT {}, {}, {} FROM (SELECT toInt64({}) AS moment)",
+                                                    table.with(), table.of("moment", "day"), table.beginning("day"),
+                                                    table.beginning("(day + 1)"), moment)),
+                          fmt::format("{}\t{}\t{}", day, days[day], days[day + 1]))
                     << fmt::format("{}", fmt::join(hours, " "));
     }
+}
+
+// Each day is what of the stretch lies between its midnights, also a first or last day of 25 hours.
+TEST_F(FleetReports, CutDaysOf25HoursWhereTheyBeginAndEnd)
+{
+    tool.setVariable("TZ=Europe/Berlin");
+    constexpr double change = 1792879200; // 25 October 2026, 00:00 there
+    insertLines(unit1, stretch(1, 1, (change - monday) / 3600 - 0.5, 25, "\"player\""));
+    const auto daysOf = [this](const std::string& since, const std::string& until) {
+        return print({"--csv", "--since", since, "--until", until});
+    };
+    EXPECT_EQ(daysOf("2026-10-24", "2026-10-26"),
+              "day,seconds,sessions,faults,mean_volume\n2026-10-24,1800.0,1,0,0.5\n2026-10-25,88200.0,1,0,0.5\n");
+    EXPECT_EQ(daysOf("2026-10-25", "2026-10-27"),
+              "day,seconds,sessions,faults,mean_volume\n2026-10-25,88200.0,1,0,0.5\n2026-10-26,0.0,0,0,\n");
+    insertLines(unit2, stretch(1, 1, (change - monday) / 3600 + 24.5, 1, "\"player\""));
+    EXPECT_EQ(daysOf("2026-10-25", "2026-10-27"),
+              "day,seconds,sessions,faults,mean_volume\n2026-10-25,90000.0,2,0,0.5\n2026-10-26,1800.0,1,0,0.5\n");
+}
+
+TEST_F(FleetReports, CanBeOfAllYearsOfAClockThatChanges)
+{
+    tool.setVariable("TZ=Africa/Casablanca");
+    insertLines(unit1, stretch(1, 1, 1, 2, "\"player\"") + fault(2, 1, 1));
+    EXPECT_THAT(print({"--csv", "--since", "1970-01-02", "--until", "2026-11-23"}),
+                HasSubstr("\n2026-11-16,7200.0,1,1,0.5\n"));
+    EXPECT_EQ(at(json({"--since", "1970-01-02", "--until", "2026-11-23"}), "seconds"), "7200");
 }
 
 TEST_F(ThreeUnits, AreAPage)
@@ -229,6 +262,188 @@ TEST_F(ThreeUnits, AreAPage)
     EXPECT_THAT(page, HasSubstr("<h2>Worst units</h2>"));
     EXPECT_THAT(page, HasSubstr("<th scope=row>1<br><span class=sub>" + unit2 + "</span>"));
     EXPECT_THAT(page, Not(HasSubstr("<script")));
+}
+
+class Shards : public FleetReports {
+protected:
+    // Two servers, with a table over both on the first.
+    Shards()
+    {
+        for (const auto* const shard : {&first, &second}) {
+            shard->makeTables();
+            for (const std::string table : {"events", "stretches", "sessions"})
+                EXPECT_EQ(shard->select(fmt::format("RENAME TABLE {0} TO {0}_local", table)), "");
+        }
+        for (const std::string table : {"events", "stretches", "sessions"})
+            EXPECT_EQ(first.select(fmt::format("CREATE TABLE {0} AS {0}_local ENGINE = Distributed(fleet, kesto, "
+                                               "{0}_local, cityHash64(device))",
+                                               table)),
+                      "");
+    }
+
+    // All that the one server has, by their hashes.
+    void divide() const
+    {
+        for (const auto& [shard, condition] :
+             {std::pair(&first, "cityHash64(device) % 2 = 0"), std::pair(&second, "cityHash64(device) % 2 = 1")})
+            for (const std::string table : {"events", "stretches", "sessions"}) {
+                const std::string rows = server.select(
+                    fmt::format("SELECT * FROM {} WHERE {} ORDER BY received FORMAT TabSeparated", table, condition));
+                EXPECT_EQ(shard->select(fmt::format("INSERT INTO {}_local FORMAT TabSeparated\n{}", table, rows)), "");
+            }
+    }
+
+    [[nodiscard]] std::string printShards(Tool::Arguments arguments) const
+    {
+        arguments.insert(arguments.begin(), {"report", "--fleet", first.address()});
+        return tool.print(arguments);
+    }
+
+    support::KeptPort firstPort;
+    support::KeptPort secondPort;
+    kesto_ingest::ClickHouseServer::Membership membership{
+        .zookeeper = "127.0.0.1:1", // is not asked
+        .cluster = fmt::format("{}:{}", firstPort.number(), secondPort.number())};
+    kesto_ingest::ClickHouseServer first{directory / "first", firstPort.number(), membership};
+    kesto_ingest::ClickHouseServer second{directory / "second", secondPort.number(), membership};
+};
+
+TEST_F(Shards, AreAskedAsOneServerIs)
+{
+    const auto unit = [](int number) { return fmt::format("{:032x}", number); };
+    for (int number = 1; number <= 6; ++number) {
+        std::string recorded = stretch(5, 2, 3, 1, "\"recorder\"");
+        recorded.replace(recorded.find("false"), 5, "true");
+        const std::string lines = stretch(1, 1, 1, number, "\"player\"") + stretch(2, 1, 20, 9, "\"browser\"")
+            + faults(10, number, 1, 2) + fault(30, 2, 3.5) + recorded + session(1, "");
+        for (int time = 0; time < 1 + number % 2; ++time)
+            insertLines(unit(number), lines, number % 3 == 0 ? "lamp" : "radio", fmt::format("1.{}", number % 4));
+    }
+    divide();
+    for (const Tool::Arguments& more : std::vector<Tool::Arguments>{
+             {"--json"}, {"--json", "--recording", "--device", "speaker"}, {"--csv", "--by", "unit"}})
+        EXPECT_EQ(printShards(inThatWeek(more)), print(inThatWeek(more)));
+    const std::string page = printShards(inThatWeek({"--html", "-"}));
+    EXPECT_THAT(page, HasSubstr("<h2>6 units</h2>"));
+    EXPECT_EQ(at(json(thatWeek), "faults"), "21");
+    EXPECT_EQ(at(json(inThatWeek({"--recording"})), "faults"), "6");
+}
+
+// An update in between gave the second row another model and release, new rules another application.
+TEST_F(FleetReports, CountRowsOnceAlsoIfTheyDiffer)
+{
+    const std::string lines = stretch(1, 1, 22, 4, "\"player\"") + fault(2, 1, 23);
+    insertLines(unit1, lines, "lamp", "1.1");
+    std::this_thread::sleep_for(std::chrono::milliseconds(1100)); // the database counts seconds
+    std::string changed = lines;
+    changed.replace(changed.find("player"), 6, "hash-1");
+    insertLines(unit1, changed, "torch", "1.2");
+    EXPECT_EQ(print(inThatWeek({"--csv", "--by", "version"})),
+              "version,seconds,sessions,faults,mean_volume,units,median_faults_an_hour,ninetieth_faults_an_hour,"
+              "most_faults_an_hour\n1.2,14400.0,1,1,0.5,1,0.25,0.25,0.25\n");
+    EXPECT_EQ(print(inThatWeek({"--csv", "--by", "unit"})),
+              fmt::format("unit,seconds,sessions,faults,mean_volume\n{},14400.0,1,1,0.5\n", unit1));
+    EXPECT_THAT(print(inThatWeek({"--csv"})), HasSubstr("\n2026-11-16,7200.0,1,1,0.5\n2026-11-17,7200.0,1,0,0.5\n"));
+    const Dictionary report = json(thatWeek);
+    EXPECT_THAT(at(report, "models"), testing::StartsWith(R"([{"model":"torch","units":1,)"));
+    EXPECT_THAT(at(report, "worst_units"), HasSubstr(R"("model":"torch","version":"1.2","seconds":14400,)"));
+    EXPECT_EQ(at(json(inThatWeek({"--application", "player"})), "seconds"), "0");
+}
+
+// Of the release that it had last.
+TEST_F(FleetReports, NameTheLastReleaseOfAWorstUnit)
+{
+    insertLines(unit1, stretch(1, 1, 1, 2, "\"player\"") + fault(2, 1, 2), "lamp", "1.9");
+    insertLines(unit1, stretch(3, 2, 30, 2, "\"player\"") + fault(4, 2, 31), "lamp", "1.10");
+    insertLines(unit2, stretch(3, 2, 30, 2, "\"player\"") + fault(4, 2, 31), "lamp", "1.10");
+    insertLines(unit2, stretch(1, 1, 1, 2, "\"player\"") + fault(2, 1, 2), "lamp", "1.9");
+    const std::string worst = at(json(thatWeek), "worst_units");
+    EXPECT_THAT(worst, HasSubstr(unit1 + R"(","model":"lamp","version":"1.10")"));
+    EXPECT_THAT(worst, HasSubstr(unit2 + R"(","model":"lamp","version":"1.10")"));
+}
+
+TEST_F(FleetReports, TellTheSameRateOfAUnitEverywhere)
+{
+    insertLines(unit1, stretch(1, 1, 1, 12767.024629 / 3600, "\"player\"") + faults(2, 7, 1, 2));
+    const Dictionary report = json(thatWeek);
+    const std::string rate = at(report, "faults_an_hour");
+    EXPECT_EQ(at(report, "faults_an_hour_of_units"),
+              fmt::format(R"({{"median":{0},"ninetieth":{0},"most":{0}}})", rate));
+    EXPECT_THAT(at(report, "worst_units"), HasSubstr(fmt::format(R"("faults_an_hour":{}}}])", rate)));
+}
+
+TEST_F(FleetReports, LeaveOutWhatTookNoTime)
+{
+    insertLines(unit1, stretch(1, 1, 1, 1e-10, "\"player\"", R"("volume":0.5)"));
+    EXPECT_THAT(print(thatWeek), HasSubstr("Nothing that matches was played"));
+}
+
+// 10.000001 s at half the slider are 5.0000005 s, and count as 5.000001 s.
+TEST_F(FleetReports, RoundVolumesAsADeviceDoes)
+{
+    insertLines(unit1, stretch(1, 1, 1, 10.000001 / 3600, "\"player\""));
+    EXPECT_EQ(at(json(thatWeek), "mean_volume"), "0.500000049999995");
+}
+
+TEST_F(FleetReports, ShowDaysOfALongSpan)
+{
+    insertLines(unit1, stretch(1, 1, 1, 2, "\"player\""));
+    const std::string days = print({"--utc", "--since", "2026-10-01", "--until", "2026-11-23", "--by", "day"});
+    EXPECT_THAT(days, HasSubstr("\n2026-11-16     2.0 h"));
+    EXPECT_THAT(days, Not(HasSubstr("2026-11-15")));
+}
+
+// So many that queries can name one by one, and more.
+TEST_F(FleetReports, CountRowsOfManyUnitsOnce)
+{
+    const auto insertUnits = [this](std::size_t first, std::size_t last) {
+        for (int time = 0; time < 2; ++time)
+            EXPECT_EQ(server.select(fmt::format(
+                          "INSERT INTO stretches (device, epoch, id, began_us, microseconds, session, application)"
+                          " SELECT toFixedString(lower(concat(hex(cityHash64(number)), hex(cityHash64(number, 1)))),"
+                          " 32) AS unit, unit, 1, {} + 82800000000, 7200000000, 1, 'player' FROM numbers({}, {})",
+                          static_cast<std::int64_t>(monday * 1e6), first, last - first)),
+                      "");
+    };
+    insertUnits(0, FleetQueries::mostUnits);
+    EXPECT_THAT(print(thatWeek), HasSubstr("6000 h played in 3000 sessions"));
+    EXPECT_THAT(print(inThatWeek({"--csv", "--by", "day"})), HasSubstr("\n2026-11-17,10800000.0,3000,0,\n"));
+    EXPECT_EQ(at(json(thatWeek), "units"), "3000");
+    insertUnits(FleetQueries::mostUnits, 3900);
+    EXPECT_THAT(print(thatWeek), HasSubstr("7800 h played in 3900 sessions"));
+    EXPECT_THAT(print(inThatWeek({"--csv", "--by", "day"})), HasSubstr("\n2026-11-17,14040000.0,3900,0,\n"));
+}
+
+TEST_F(FleetReports, DrawApplicationsWithLongNames)
+{
+    std::string lines;
+    for (int index = 1; index <= 8; ++index)
+        lines += stretch(index, index, index, 1, fmt::format("\"{}{}\"", index, std::string(16'000, 'x')));
+    insertLines(unit1, lines);
+    EXPECT_THAT(print(inThatWeek({"--html", "-"})), HasSubstr("<h1>Audio report of a fleet</h1>"));
+}
+
+// As the server's settings say while it answers.
+TEST_F(FleetReports, LimitTheTimeOfTheServerToo)
+{
+    EXPECT_EQ(server.select("RENAME TABLE stretches TO real_stretches"), "");
+    EXPECT_EQ(server.select("CREATE VIEW stretches AS SELECT * FROM real_stretches WHERE (SELECT throwIf(value = '7')"
+                            " FROM system.settings WHERE name = 'max_execution_time') = 0"),
+              "");
+    EXPECT_THAT(print(inThatWeek({"--time-limit", "8"})), HasSubstr("Nothing that matches was played"));
+    EXPECT_THAT(failure(inThatWeek({"--time-limit", "7"})), HasSubstr("throwIf"));
+}
+
+TEST_F(FleetReports, KnowAnAnswerThatIsCut)
+{
+    fleet_database::ClickHouseServers servers({.servers = {server.address()}}, 6);
+    const auto isFinal = [](const fleet_database::Answer&) { return true; };
+    const auto whole = servers.ask("", "SELECT 12345", isFinal);
+    EXPECT_EQ(whole.text, "12345\n");
+    EXPECT_FALSE(whole.isCut);
+    const auto cut = servers.ask("", "SELECT 123456", isFinal);
+    EXPECT_EQ(cut.text, "123456");
+    EXPECT_TRUE(cut.isCut);
 }
 
 TEST_F(FleetReports, SayWhyTheDatabaseCannotBeAsked)
