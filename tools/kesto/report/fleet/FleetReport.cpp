@@ -181,6 +181,7 @@ private:
 std::vector<std::int64_t> boundaries(const std::vector<ReportDay>& days, const TimeSpan& span)
 {
     std::vector<std::int64_t> moments;
+    moments.reserve(days.size() + 1);
     for (const ReportDay& day : days)
         moments.push_back(foundation::wholeMicroseconds(day.span.from));
     moments.push_back(foundation::wholeMicroseconds(span.until));
