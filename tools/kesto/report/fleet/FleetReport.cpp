@@ -141,7 +141,7 @@ private:
     // Of the server, too, which else goes on when nobody waits any more. Who may only read may not say so.
     void limitTime()
     {
-        constexpr std::string_view mayOnlyRead = "1";
+        static constexpr std::string_view mayOnlyRead = "1";
         ask("SELECT value FROM system.settings WHERE name = 'readonly'", [this](Cells& row) {
             if (row.text() != mayOnlyRead)
                 servers_.set("max_execution_time", std::to_string(configuration_.timeLimit.count()));
@@ -181,6 +181,7 @@ private:
 std::vector<std::int64_t> boundaries(const std::vector<ReportDay>& days, const TimeSpan& span)
 {
     std::vector<std::int64_t> moments;
+    moments.reserve(days.size() + 1);
     for (const ReportDay& day : days)
         moments.push_back(foundation::wholeMicroseconds(day.span.from));
     moments.push_back(foundation::wholeMicroseconds(span.until));
