@@ -45,6 +45,15 @@ protected:
         return slowWork.get_future();
     }
     void endWork() { slowWork(); }
+    // The database stores the load with the event 3, and the ingest has taken that with the event 6.
+    void takeTwoLoads()
+    {
+        isSlow = true;
+        send(deviceLine(1, 3) + eventLine(3));
+        turns(2);
+        send(deviceLine(4, 6) + eventLine(6));
+        turns(1);
+    }
     void turns(int count)
     {
         for (int turn = 0; turn < count; ++turn)
@@ -100,11 +109,8 @@ TEST_F(IngestTest, JoinsManyBatchesIntoOneInsert)
 
 TEST_F(IngestTest, TakesTheNextLoadWhileTheDatabaseStoresOne)
 {
-    isSlow = true;
-    send(deviceLine(1, 3) + eventLine(3));
+    takeTwoLoads();
     turns(2);
-    send(deviceLine(4, 6) + eventLine(6));
-    turns(3);
     EXPECT_EQ(metrics.count(Counter::BatchesTaken), 2U);
     EXPECT_EQ(metrics.waitingRows.load(), 4U) << "two events and two rows of batches";
     EXPECT_THAT(database.blocks, IsEmpty());
@@ -140,11 +146,7 @@ TEST_F(IngestTest, TakesNoMoreThanOneLoadWhileTheDatabaseStoresOne)
 
 TEST_F(IngestTest, StoresNoLoadBeforeAnEarlierOneThatFailed)
 {
-    isSlow = true;
-    send(deviceLine(1, 3) + eventLine(3));
-    turns(2);
-    send(deviceLine(4, 6) + eventLine(6));
-    turns(1);
+    takeTwoLoads();
     database.isAway = true;
     endWork();
     turns(1);
@@ -161,11 +163,7 @@ TEST_F(IngestTest, StoresNoLoadBeforeAnEarlierOneThatFailed)
 
 TEST_F(IngestTest, GivesBackBothLoadsThatItCannotStoreBeforeItEnds)
 {
-    isSlow = true;
-    send(deviceLine(1, 3) + eventLine(3));
-    turns(2);
-    send(deviceLine(4, 6) + eventLine(6));
-    turns(1);
+    takeTwoLoads();
     database.isAway = true;
     endWork();
     ingest->finish();
@@ -195,11 +193,7 @@ TEST_F(IngestTest, JoinsWhatAFullLoadLeftWithWhatComesLater)
 
 TEST_F(IngestTest, WaitsForTheDatabaseBeforeItEnds)
 {
-    isSlow = true;
-    send(deviceLine(1, 3) + eventLine(3));
-    turns(2);
-    send(deviceLine(4, 6) + eventLine(6));
-    turns(1);
+    takeTwoLoads();
     isSlow = false;
     endWork();
     ingest->finish();
