@@ -34,7 +34,7 @@ public:
     [[nodiscard]] std::vector<std::string> addresses() const;
     [[nodiscard]] std::string configuredAddresses() const; // as a list of TOML
 
-    // A stream may keep messages that its consumer gives to nobody any more: these do not count as waiting.
+    // A server that was killed may keep messages that an ingest has acknowledged. They do not count as waiting.
     [[nodiscard]] StreamState stream();
     void awaitWhole(); // a leader, and all members have all
     // The numbers of servers. With one server, both are that one.

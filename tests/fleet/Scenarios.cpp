@@ -54,8 +54,8 @@ std::string throughRelay(const Relay& relay, const char* scheme)
 
 void beOffline(Fleet& fleet)
 {
-    const support::KeptPort nobody; // listens there
-    const std::vector<std::string> away{fmt::format("nats://127.0.0.1:{}", nobody.number())};
+    const support::KeptPort port; // no server listens on it
+    const std::vector<std::string> away{fmt::format("nats://127.0.0.1:{}", port.number())};
     fleet.withDevices(part(fleet), [&](Device& device) {
         device.useServers(away);
         for (int day = 0; day < 3; ++day) {
@@ -117,7 +117,7 @@ void forge(Fleet& fleet)
     kesto_ingest::JetStream stream({.servers = fleet.broker.addresses(), .user = forger, .password = forger});
     const auto forbidden = stream.publish("kesto.events." + victim, "x", {{"Kesto-Edition", "1"}});
     expect(!forbidden && forbidden.error().contains("Permissions Violation"),
-           "the broker lets nobody publish under the name of another");
+           "the broker refuses a batch under the name of another credential");
 }
 
 void useSlowLink(Fleet& fleet)

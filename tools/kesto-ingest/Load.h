@@ -16,7 +16,7 @@
 
 namespace kesto_ingest {
 
-// A batch, until its device is told.
+// A batch that the ingest holds until it has told the device.
 struct Held {
     Delivery delivery;
     std::vector<BadRow> badRows{};

@@ -159,7 +159,7 @@ private:
         case wrongPassword:
         case requiredPassword:
             return std::runtime_error(
-                fmt::format("the database does not let the user {} in: name a file with another user and password by "
+                fmt::format("the database refuses the user {}: name a file with another user and password by "
                             "--credentials ({})",
                             configuration_.user.empty() ? "default" : configuration_.user, text));
         case tookTooLong:

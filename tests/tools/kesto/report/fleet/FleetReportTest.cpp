@@ -455,12 +455,12 @@ TEST_F(FleetReports, SayWhyTheDatabaseCannotBeAsked)
               "kesto: the tables in the database kesto are of edition 7, and this program reads edition 1: update the "
               "older of the two\n");
     EXPECT_THAT(failure({"--fleet-database", "other"}), HasSubstr("the database other has no tables"));
-    support::writeFile(directory / "credentials", "user = \"nobody\"\npassword = \"wrong\"\n");
+    support::writeFile(directory / "credentials", "user = \"stranger\"\npassword = \"wrong\"\n");
     std::filesystem::permissions(directory / "credentials", std::filesystem::perms(0644));
     EXPECT_THAT(failure({"--credentials", directory / "credentials"}), HasSubstr("everybody may read it: chmod o-r"));
     std::filesystem::permissions(directory / "credentials", std::filesystem::perms(0600));
     EXPECT_THAT(failure({"--credentials", directory / "credentials"}),
-                HasSubstr("the database does not let the user nobody in: name a file with another user and password by "
+                HasSubstr("the database refuses the user stranger: name a file with another user and password by "
                           "--credentials"));
     EXPECT_EQ(server.select("DROP TABLE edition"), "");
     EXPECT_EQ(server.select("CREATE VIEW edition AS SELECT toUInt64(1) AS edition"), "");
