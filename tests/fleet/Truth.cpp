@@ -150,13 +150,14 @@ SumsOfRows Truth::sums(const Chapters& chapters)
     SumsOfRows all;
     for (const Chapter& chapter : chapters) {
         std::int64_t newest = 0;
-        select(*open(chapter.store), "SELECT next_event FROM store", {},
-               [&](sqlite3_stmt* row) { newest = sqlite3_column_int64(row, 0); });
-        Known& known =
-            known_[fmt::format("{} {} {} {}", chapter.store.native(), chapter.pseudonym, chapter.after, chapter.upTo)];
+        std::string epoch; // names the database: another one may come to the same place
+        select(*open(chapter.store), "SELECT next_event, epoch FROM store", {}, [&](sqlite3_stmt* row) {
+            newest = sqlite3_column_int64(row, 0);
+            epoch = text(row, 1);
+        });
+        Known& known = known_[fmt::format("{} {} {} {}", epoch, chapter.pseudonym, chapter.after, chapter.upTo)];
         if (known.newest != newest) {
             known = {.newest = newest, .sums = {}};
-            const std::string epoch = epochOf(chapter);
             for (const Kind kind : allKinds) {
                 Sums sums;
                 forEachRow(chapter, kind, [&sums](const TrueRow& row) {
