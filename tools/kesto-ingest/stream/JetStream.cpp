@@ -136,12 +136,21 @@ struct JetStream::Connection {
         return {};
     }
 
+    // The thread of libnats that receives looks a subscription up and uses it without holding it. So one that is given
+    // up still lives for a while: until the next one is given up, or the connection has ended.
+    void giveUp(natsSubscription* former)
+    {
+        static_cast<void>(natsSubscription_Unsubscribe(former));
+        givenUp.reset(former);
+    }
+
     std::chrono::milliseconds timeLimit{};
     std::string inboxes = "_INBOX"; // the beginning of their names
     LastWords words;
     OwnedConnection connection;
     OwnedContext context;
     OwnedSubscription subscription;
+    OwnedSubscription givenUp;
 };
 
 JetStream::JetStream(const JetStreamConfiguration& configuration) : connection_(std::make_unique<Connection>())
@@ -193,8 +202,11 @@ JetStream::JetStream(const JetStreamConfiguration& configuration) : connection_(
 
 JetStream::~JetStream()
 {
-    if (connection_->connection)
-        static_cast<void>(natsConnection_FlushTimeout(connection_->connection.get(), 2000)); // acknowledgements
+    natsConnection* const connection = connection_->connection.get();
+    if (connection == nullptr)
+        return;
+    static_cast<void>(natsConnection_FlushTimeout(connection, 2000)); // acknowledgements
+    natsConnection_Close(connection); // and with it the thread that receives
 }
 
 std::expected<void, std::string> JetStream::setUp(const StreamSizes& sizes)
@@ -272,7 +284,7 @@ std::expected<std::vector<Delivery>, std::string> JetStream::fetch(std::size_t m
     if (status == NATS_TIMEOUT && connection_->isUp())
         return {};
     if (status != NATS_OK) {
-        connection_->subscription.reset();
+        connection_->giveUp(connection_->subscription.release());
         return std::unexpected(connection_->reason("no batches come", status));
     }
     std::vector<Delivery> deliveries;
@@ -359,7 +371,8 @@ std::expected<void, std::string> JetStream::putSome(std::span<const Put> puts, s
     if (status == NATS_OK)
         status =
             natsConnection_SubscribeSync(&madeSubscription, connection_->connection.get(), (beginning + '*').c_str());
-    const OwnedSubscription subscription(madeSubscription);
+    const auto giveUp = [this](natsSubscription* subscription) { connection_->giveUp(subscription); };
+    const std::unique_ptr<natsSubscription, decltype(giveUp)> subscription(madeSubscription, giveUp);
     for (std::size_t place = 0; place < puts.size() && status == NATS_OK; ++place)
         status = sendPut(*connection_->connection, puts[place], beginning + fmt::format("{}", place));
     for (std::size_t count = 0; count < puts.size() && status == NATS_OK; ++count) {

@@ -202,12 +202,24 @@ Answer JetStream::connect()
     return worst.value_or(refused("the configuration names no servers"));
 }
 
+// The library's thread that receives looks a subscription up and uses it without holding it: a message that comes
+// meanwhile would meet a destroyed one. So subscriptions live until the connection, and with it this thread, has ended.
 void JetStream::disconnect()
 {
+    {
+        const std::scoped_lock lock(mutex_);
+        if (connection_)
+            natsConnection_Close(connection_.get());
+    }
     confirmations_.reset();
     context_.reset();
     const std::scoped_lock lock(mutex_);
     connection_.reset();
+}
+
+JetStream::~JetStream()
+{
+    disconnect();
 }
 
 void JetStream::interrupt()
@@ -291,9 +303,12 @@ Transport::Confirmed JetStream::lastConfirmation(const std::string& device)
         return std::unexpected(withoutConnection());
     const std::string subject = fmt::format("kesto.stored.{}.{}", credentials_.name, device);
     // First listen, then ask: what comes in between is told twice, and nothing is missed.
-    natsSubscription* made = nullptr;
-    natsStatus status = natsConnection_SubscribeSync(&made, connection_.get(), subject.c_str());
-    confirmations_.reset(made);
+    natsStatus status = NATS_OK;
+    if (!confirmations_) {
+        natsSubscription* made = nullptr;
+        status = natsConnection_SubscribeSync(&made, connection_.get(), subject.c_str());
+        confirmations_.reset(made);
+    }
     jsDirectGetMsgOptions which;
     jsDirectGetMsgOptions_Init(&which);
     which.LastBySubject = subject.c_str();

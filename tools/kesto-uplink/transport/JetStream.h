@@ -34,6 +34,9 @@ struct TimeLimits {
 class JetStream : public Transport {
 public:
     JetStream(Servers servers, Credentials credentials, TimeLimits limits = {});
+    ~JetStream() override;
+    JetStream(const JetStream&) = delete;
+    JetStream& operator=(const JetStream&) = delete;
 
     Answer connect() override;
     void disconnect() override;
@@ -69,7 +72,7 @@ private:
 
     std::mutex mutex_; // of the two below, while connections are exchanged or interrupted
     bool isInterrupted_ = false;
-    Connection connection_; // destroyed behind what uses it
+    Connection connection_;
     std::string server_; // of the connection
     Context context_;
     Subscription confirmations_;

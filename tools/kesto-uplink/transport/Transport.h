@@ -56,7 +56,8 @@ public:
     // The stream stores a message of this ID once, as far back as it remembers IDs.
     virtual Answer put(const std::string& id, std::string_view batch) = 0;
 
-    // The last confirmation for the device of this pseudonym, or none if there never was one.
+    // The last confirmation for the device of this pseudonym, or none if there never was one. A connection is that of
+    // one device.
     virtual Confirmed lastConfirmation(const std::string& device) = 0;
     // The next confirmation behind that of `lastConfirmation`, for the same device, or none within the limit.
     virtual Confirmed awaitConfirmation(std::chrono::milliseconds limit) = 0;

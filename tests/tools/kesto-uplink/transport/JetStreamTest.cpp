@@ -245,6 +245,43 @@ TEST(JetStream, serversWithoutTheStreamAreAway)
 }
 
 // Speaks the least that a client needs to connect.
+void greet(int client)
+{
+    const std::string greeting = "INFO {\"server_id\":\"a\",\"version\":\"2.10.0\",\"proto\":1,\"headers\":true,"
+                                 "\"max_payload\":1048576}\r\n";
+    EXPECT_EQ(::write(client, greeting.data(), greeting.size()), greeting.size());
+    std::array<char, 4096> bytes{};
+    for (std::string heard; !heard.contains("PING\r\n");) {
+        const ssize_t size = ::read(client, bytes.data(), bytes.size());
+        ASSERT_GT(size, 0) << heard;
+        heard.append(bytes.data(), static_cast<std::size_t>(size));
+    }
+    EXPECT_EQ(::write(client, "PONG\r\n", 6), 6);
+}
+
+TEST(JetStream, aConnectionMayEndWhileConfirmationsCome)
+{
+    constexpr int connections = 100;
+    const Listener listener;
+    std::jthread server([&] {
+        const std::string message = "MSG kesto.stored.alpha.0123 1 0\r\n\r\n"; // of the first subscription
+        std::string messages;
+        for (int number = 0; number < 1000; ++number)
+            messages += message;
+        for (int number = 0; number < connections; ++number) {
+            const platform::FileDescriptor client = listener.accept();
+            greet(client.get());
+            while (::send(client.get(), messages.data(), messages.size(), MSG_NOSIGNAL) > 0) { }
+        }
+    });
+    for (int number = 0; number < connections; ++number) {
+        JetStream transport({.urls = {listener.url()}}, alpha, {.connect = 10s, .answer = 5ms});
+        ASSERT_TRUE(transport.connect().isStored());
+        EXPECT_FALSE(transport.lastConfirmation("0123")); // nobody answers that
+        transport.disconnect();
+    }
+}
+
 TEST(JetStream, anInterruptionWhileItConnectsEndsThatCallAndAllLaterOnes)
 {
     const Listener listener;
@@ -252,16 +289,7 @@ TEST(JetStream, anInterruptionWhileItConnectsEndsThatCallAndAllLaterOnes)
     std::jthread server([&] {
         const platform::FileDescriptor client = listener.accept();
         transport.interrupt();
-        const std::string greeting = "INFO {\"server_id\":\"a\",\"version\":\"2.10.0\",\"proto\":1,\"headers\":true,"
-                                     "\"max_payload\":1048576}\r\n";
-        EXPECT_EQ(::write(client.get(), greeting.data(), greeting.size()), greeting.size());
-        std::array<char, 4096> bytes{};
-        for (std::string heard; !heard.contains("PING\r\n");) {
-            const ssize_t size = ::read(client.get(), bytes.data(), bytes.size());
-            ASSERT_GT(size, 0) << heard;
-            heard.append(bytes.data(), static_cast<std::size_t>(size));
-        }
-        EXPECT_EQ(::write(client.get(), "PONG\r\n", 6), 6);
+        greet(client.get());
     });
     EXPECT_EQ(transport.connect().kind, Answer::Kind::Interrupted);
     EXPECT_EQ(transport.put("a", "1").kind, Answer::Kind::Interrupted);
