@@ -20,7 +20,10 @@ using kesto::Status;
 using sdk_test::Answers;
 using sdk_test::FakeService;
 using sdk_test::Peer;
+using testing::AllOf;
 using testing::ElementsAre;
+using testing::Gt;
+using testing::Le;
 using testing::UnorderedElementsAre;
 
 const std::string lost = ": the connection to the service was lost";
@@ -168,9 +171,9 @@ TEST_F(ConnectionLossTest, DoublesThePauseBetweenAttemptsUpToTheLongest)
     kesto::Options options;
     options.socketPath = path_;
     options.reconnect = true;
-    options.firstRetry = std::chrono::milliseconds(1);
-    options.longestRetry = std::chrono::milliseconds(6);
-    sdk_test::Recorder<std::int64_t> pauses;
+    options.firstRetry = std::chrono::milliseconds(20);
+    options.longestRetry = std::chrono::milliseconds(120);
+    sdk_test::Recorder<std::int64_t> pauses; // what is left of them when the client tells
     options.stateChanged = [&](const kesto::StateChange& change) {
         if (change.state == State::Disconnected)
             pauses.add(change.retryAfter.count());
@@ -178,7 +181,9 @@ TEST_F(ConnectionLossTest, DoublesThePauseBetweenAttemptsUpToTheLongest)
     kesto::Client client; // destroyed before the objects that its callback uses
     ASSERT_EQ(client.open(options), Status::Ok);
     const auto first = pauses.waitFor(5);
-    EXPECT_THAT(std::vector(first.begin(), first.begin() + 5), ElementsAre(1, 2, 4, 6, 6));
+    const auto isMostOf = [](std::int64_t pause) { return AllOf(Gt(pause / 2), Le(pause)); };
+    EXPECT_THAT(std::vector(first.begin(), first.begin() + 5),
+                ElementsAre(isMostOf(20), isMostOf(40), isMostOf(80), isMostOf(120), isMostOf(120)));
 }
 
 TEST_F(ConnectionLossTest, KillingTheServiceIsAnsweredByTheLossOfTheConnection)

@@ -419,6 +419,8 @@ protected:
     {
         if (threadSanitizerWatches)
             GTEST_SKIP() << "the thread sanitizer makes system calls of its own whenever it sees a new atomic";
+        if (::prctl(PR_GET_SECCOMP) < 0)
+            GTEST_SKIP() << "an emulator of a processor filters no system calls";
     }
 
     int statusOf(void (*report)(kesto::Client&))
