@@ -206,7 +206,7 @@ void Ingest::take(Delivery delivery)
         taking_.bytes += sizeof(BadRow) + row.reason.size() + row.line.size();
     taking_.bytes += delivery.payload.size();
     for (const Row& row : batch->rows)
-        taking_.add(row, limits_.rows);
+        taking_.add(row, batch->jsonOf(row), limits_.rows);
     metrics_.waitingRows += batch->rows.size();
     const Confirmation confirmation = {credential, batch->device, batch->epoch, batch->last, delivery.isRepeated};
     hold({.delivery = std::move(delivery), .badRows = std::move(batch->badRows), .confirmation = confirmation});
