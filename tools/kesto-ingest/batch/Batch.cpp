@@ -31,12 +31,9 @@ double momentOf(const RowReader& row)
     return isKnown ? moment : row.number(kind.otherMoment);
 }
 
-// `json` ends in the bracket that opens the row, or in its last column.
 void appendColumnName(std::string_view column, std::string& json)
 {
-    json += json.back() == '{' ? "\"" : ",\"";
-    json += column;
-    json += "\":";
+    ((json += ",\"") += column) += "\":";
 }
 
 void appendColumn(const Field& field, const RowReader& row, std::string& json)
@@ -52,9 +49,7 @@ void appendColumn(const Field& field, const RowReader& row, std::string& json)
     case FieldType::Integer:
     case FieldType::Count: json += entry->text; break;
     case FieldType::Length: appendWhole(foundation::wholeMicroseconds(entry->number), json); break;
-    case FieldType::Share:
-        appendWhole(foundation::wholeMillionths(std::clamp(entry->number, 0.0, 1.0)), json);
-        break;
+    case FieldType::Share: appendWhole(foundation::wholeMillionths(std::clamp(entry->number, 0.0, 1.0)), json); break;
     case FieldType::Flag: json += entry->kind == ValueKind::True ? '1' : '0'; break;
     case FieldType::Name: appendText(foundation::cutBetweenCharacters(entry->text, longestName), json); break;
     case FieldType::Digits:
@@ -96,6 +91,7 @@ private:
         batch_.device = row_.text(Key::Device);
         batch_.epoch = row_.text(Key::Epoch);
         batch_.last = row_.identity(Key::Last);
+        beginning_ = fmt::format(R"({{"device":"{}","epoch":"{}")", batch_.device, batch_.epoch);
         if (row_.identity(Key::First) > batch_.last)
             return std::unexpected("its first row names a range that ends before it begins");
         for (const Key label : {Key::Model, Key::Version})
@@ -134,7 +130,7 @@ private:
         constexpr double beforeThursday = 3 * 86400; // 1970 began on one
         std::string& json = batch_.json;
         const std::size_t begin = json.size();
-        json += '{';
+        json += beginning_;
         for (const Field& field : row_.kind().fields)
             appendColumn(field, row_, json);
         const double moment = momentOf(row_);
@@ -147,14 +143,14 @@ private:
         auto week = static_cast<std::uint32_t>((moment + beforeThursday) / secondsOfWeek);
         if (row_.number(Key::Seconds) > secondsOfDay)
             week += weekOfLong;
-        batch_.rows.push_back(
-            {.table = row_.kind().table, .week = week, .begin = begin, .size = json.size() - begin});
+        batch_.rows.push_back({.table = row_.kind().table, .week = week, .begin = begin, .size = json.size() - begin});
     }
 
     RowReader row_;
     Batch batch_;
     bool isBegun_ = false;
-    std::string labels_;
+    std::string beginning_; // of every row
+    std::string labels_; // at the end of every row but the first
 };
 
 } // namespace

@@ -4,6 +4,7 @@
 
 #include <fmt/format.h>
 
+#include <bit>
 #include <cstdint>
 #include <cstring>
 #include <iterator>
@@ -16,15 +17,22 @@ constexpr std::uint64_t everyByte = 0x0101010101010101;
 constexpr std::uint64_t highBits = 0x8080808080808080;
 constexpr unsigned char firstPrintable = 0x20;
 
-// A byte beside one that is escaped may look so, too.
-bool hasEscaped(std::uint64_t word) noexcept
+// The first eight characters, of which the first is in the lowest byte.
+std::uint64_t wordAt(const char* text) noexcept
+{
+    std::uint64_t word = 0;
+    std::memcpy(&word, text, sizeof word);
+    return std::endian::native == std::endian::little ? word : std::byteswap(word);
+}
+
+// The highest bit of each byte that is escaped. Bytes above such a one may have it, too.
+std::uint64_t escapedIn(std::uint64_t word) noexcept
 {
     const std::uint64_t quotes = word ^ (everyByte * '"');
     const std::uint64_t backslashes = word ^ (everyByte * '\\');
-    return ((((word - everyByte * firstPrintable) & ~word) | ((quotes - everyByte) & ~quotes)
-             | ((backslashes - everyByte) & ~backslashes))
-            & highBits)
-        != 0;
+    return (((word - everyByte * firstPrintable) & ~word) | ((quotes - everyByte) & ~quotes)
+            | ((backslashes - everyByte) & ~backslashes))
+        & highBits;
 }
 
 bool isEscaped(char character) noexcept
@@ -73,11 +81,9 @@ void escapeTwice(char character, std::string& json)
 std::size_t plainLength(std::string_view text) noexcept
 {
     std::size_t length = 0;
-    for (std::uint64_t word = 0; length + sizeof word <= text.size(); length += sizeof word) {
-        std::memcpy(&word, text.data() + length, sizeof word);
-        if (hasEscaped(word))
-            break;
-    }
+    for (; length + sizeof(std::uint64_t) <= text.size(); length += sizeof(std::uint64_t))
+        if (const std::uint64_t escaped = escapedIn(wordAt(text.data() + length)); escaped != 0)
+            return length + static_cast<std::size_t>(std::countr_zero(escaped)) / 8;
     while (length < text.size() && !isEscaped(text[length]))
         ++length;
     return length;

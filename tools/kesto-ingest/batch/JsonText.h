@@ -44,8 +44,8 @@ public:
 private:
     void separate()
     {
-        const bool isFirst = content_.empty() || std::string_view("{[:").contains(content_.back());
-        if (!isFirst)
+        const char last = content_.empty() ? '{' : content_.back();
+        if (last != '{' && last != '[' && last != ':')
             content_ += ',';
     }
 

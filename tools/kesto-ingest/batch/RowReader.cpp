@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// RapidJSON reads a copy of the line and leaves its texts there, without their escapes; the handler keeps where they are,
-// and writes the payload again without spaces.
+// RapidJSON reads a copy of the line and leaves its texts there, without their escapes; the handler keeps where they
+// are, and writes the payload again without spaces.
 #include "kesto-ingest/batch/RowReader.h"
 
 #include "foundation/values/String.h"
@@ -34,9 +34,7 @@ template <typename Number> std::optional<Number> numberIn(std::string_view text)
 // A line that RapidJSON reads in place. When it begins with a text, what needs no change there is behind it at once.
 class LineStream : public rapidjson::InsituStringStream {
 public:
-    explicit LineStream(std::string& line)
-        : rapidjson::InsituStringStream(line.data()),
-          end_(line.data() + line.size())
+    explicit LineStream(std::string& line) : rapidjson::InsituStringStream(line.data()), end_(line.data() + line.size())
     {
     }
 

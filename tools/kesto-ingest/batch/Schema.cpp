@@ -13,8 +13,8 @@ constexpr bool required = true;
 constexpr bool optional = false;
 
 constexpr Field deviceFields[] = {
-    {Key::Device, FieldType::Digits, required, "device"},
-    {Key::Epoch, FieldType::Digits, required, "epoch"},
+    {Key::Device, FieldType::Digits, required, ""},
+    {Key::Epoch, FieldType::Digits, required, ""},
     {Key::Kind, FieldType::Text, required, ""},
     {Key::Model, FieldType::Label, optional, "model"},
     {Key::Version, FieldType::Label, optional, "version"},
@@ -24,8 +24,8 @@ constexpr Field deviceFields[] = {
 };
 
 constexpr Field eventFields[] = {
-    {Key::Device, FieldType::Digits, required, "device"},
-    {Key::Epoch, FieldType::Digits, required, "epoch"},
+    {Key::Device, FieldType::Digits, required, ""},
+    {Key::Epoch, FieldType::Digits, required, ""},
     {Key::Kind, FieldType::Text, required, ""},
     {Key::Id, FieldType::Identity, required, "id"},
     {Key::Time, FieldType::Moment, required, "time"},
@@ -39,8 +39,8 @@ constexpr Field eventFields[] = {
 };
 
 constexpr Field stretchFields[] = {
-    {Key::Device, FieldType::Digits, required, "device"},
-    {Key::Epoch, FieldType::Digits, required, "epoch"},
+    {Key::Device, FieldType::Digits, required, ""},
+    {Key::Epoch, FieldType::Digits, required, ""},
     {Key::Kind, FieldType::Text, required, ""},
     {Key::Id, FieldType::Identity, required, "id"},
     {Key::Recording, FieldType::Flag, required, "recording"},
@@ -56,8 +56,8 @@ constexpr Field stretchFields[] = {
 };
 
 constexpr Field sessionFields[] = {
-    {Key::Device, FieldType::Digits, required, "device"},
-    {Key::Epoch, FieldType::Digits, required, "epoch"},
+    {Key::Device, FieldType::Digits, required, ""},
+    {Key::Epoch, FieldType::Digits, required, ""},
     {Key::Kind, FieldType::Text, required, ""},
     {Key::Id, FieldType::Identity, required, "id"},
     {Key::Reporter, FieldType::Integer, optional, "reporter"},
@@ -76,11 +76,10 @@ constexpr std::array<RowKind, tableCount> kinds = {
 };
 
 constexpr std::array<std::string_view, keyCount> keyNames = {
-    "device",   "epoch",       "kind",      "model",   "version", "sent",           "first",
-    "last",     "id",          "time",      "name",    "payload", "session",        "happened",
-    "application", "recording", "began",    "seconds", "device_name", "format",     "channels",
-    "volume",   "ending",      "reporter",  "service", "process", "ended",          "active_devices",
-    "late_cycles"};
+    "device",  "epoch",   "kind",        "model",          "version",    "sent",     "first",       "last",
+    "id",      "time",    "name",        "payload",        "session",    "happened", "application", "recording",
+    "began",   "seconds", "device_name", "format",         "channels",   "volume",   "ending",      "reporter",
+    "service", "process", "ended",       "active_devices", "late_cycles"};
 
 std::optional<Key> findKey(std::string_view name, Key first, Key last) noexcept
 {

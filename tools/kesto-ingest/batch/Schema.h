@@ -67,7 +67,7 @@ struct Field {
     Key key;
     FieldType type;
     bool isRequired; // if not, a value that does not fit is left out
-    std::string_view column; // empty: it is no column
+    std::string_view column; // empty: it is none, or one with which every row begins
 };
 
 struct RowKind {
