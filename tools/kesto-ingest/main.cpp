@@ -56,9 +56,9 @@ void rest(Milliseconds time)
 // kernel anew, page by page, in as much time as it takes to read the rows.
 void keepFreedMemory()
 {
-    constexpr int mostBytes = 32 * 1024 * 1024; // as a load
-    mallopt(M_MMAP_THRESHOLD, mostBytes);
-    mallopt(M_TRIM_THRESHOLD, 2 * mostBytes);
+    constexpr int megabyte = 1024 * 1024;
+    mallopt(M_MMAP_THRESHOLD, 16 * megabyte); // as a block
+    mallopt(M_TRIM_THRESHOLD, 32 * megabyte); // as a load
 }
 
 void handleSignals()

@@ -64,6 +64,7 @@ class BatchReader {
 public:
     std::expected<Batch, std::string> read(std::string_view lines)
     {
+        batch_.json.reserve(lines.size() + lines.size() / 2); // enough for most
         while (!lines.empty()) {
             const std::size_t end = lines.find('\n');
             const std::string_view line = lines.substr(0, end);
