@@ -58,7 +58,7 @@ enum class Key : std::uint8_t {
     ActiveDevices, // the payload's own, as the next
     LateCycles
 };
-constexpr std::size_t keyCount = 29;
+constexpr std::size_t keyCount = static_cast<std::size_t>(Key::LateCycles) + 1;
 
 enum class Table : std::uint8_t { Batches, Events, Stretches, Sessions };
 constexpr std::size_t tableCount = 4;

@@ -111,6 +111,17 @@ TEST(Batch, BecomesRowsWithTheColumnsOfTheirTables)
     EXPECT_EQ(batch.rows[1].week, 2968U); // 1795264505 s and three days are 2968.8 weeks
 }
 
+TEST(Batch, PutsTextsInTheColumnsOfTheirKeys)
+{
+    std::string stretch = stretchLine(4);
+    stretch.replace(stretch.find(R"("application")"), 0, R"("format":"S16LE",)");
+    std::string session = sessionLine(7, "");
+    session.replace(session.find(R"("application")"), 0, R"("service":"media","process":"mpv",)");
+    const Batch batch = batchOf(deviceLine(1, 9) + stretch + session);
+    EXPECT_THAT(jsonOf(batch, 1), HasSubstr(R"("audio_device":"headset","format":"S16LE","channels":2,)"));
+    EXPECT_THAT(jsonOf(batch, 2), HasSubstr(R"("service":"media","application":"player","process":"mpv","began":)"));
+}
+
 TEST(Batch, RoundsMomentsToMicrosecondsAndVolumesToMillionths)
 {
     const auto stretchWith = [](std::string_view now) {
