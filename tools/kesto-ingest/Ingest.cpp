@@ -135,7 +135,9 @@ bool Ingest::isDue() const
 
 bool Ingest::isFull() const
 {
-    return taking_.rows >= limits_.rows || taking_.bytes >= limits_.bytes;
+    // A busy database gets several inserts in one load: their small ones and their answers are joined, too.
+    const std::size_t inserts = isStoring() ? limits_.insertsOfALoad : 1;
+    return taking_.rows >= inserts * limits_.rows || taking_.bytes >= limits_.bytes;
 }
 
 // A device that is told of a batch forgets what is in the earlier ones, too.

@@ -29,7 +29,8 @@ namespace kesto_ingest {
 
 struct IngestLimits {
     std::size_t rows = 10'000; // joined into one insert
-    std::size_t bytes = 32 * 1024 * 1024; // the same
+    std::size_t insertsOfALoad = 4; // are taken at the most while the database stores another load
+    std::size_t bytes = 32 * 1024 * 1024; // of a load
     std::chrono::milliseconds joining{1000}; // the longest time that a batch waits for others
     std::chrono::milliseconds shortestPause{500}; // after a failure; doubled with each, up to the longest
     std::chrono::milliseconds longestPause{30'000};
