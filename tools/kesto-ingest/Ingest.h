@@ -4,7 +4,8 @@
 // Everything that a batch leads to is done before the batch is acknowledged, and all of it may be done twice: rows have
 // keys, dead letters and confirmations too. So a kill at any moment loses nothing.
 //
-// While the database stores one load, the next is taken: reading rows and inserting them need about as much time.
+// While the database stores one load, the next is taken. It may become larger: reading rows is quicker than inserting
+// them.
 #pragma once
 
 #include "kesto-ingest/Load.h"
