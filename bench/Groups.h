@@ -11,6 +11,7 @@ void measureRoundTrip(const BenchOptions& options, Report& report);
 void measurePipeline(const BenchOptions& options, Report& report);
 void measureStored(const BenchOptions& options, Report& report);
 void measureStoredQueries(const BenchOptions& options, Report& report);
+void measureIngest(const BenchOptions& options, Report& report);
 void measureReports(const BenchOptions& options, Report& report);
 void measureGrowingSession(const BenchOptions& options, Report& report);
 void measureSessionEnd(const BenchOptions& options, Report& report);

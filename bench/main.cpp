@@ -27,6 +27,7 @@ constexpr std::array groups{
     MeasurementGroup{"stored", "messages a second that become stored events", measureStored},
     MeasurementGroup{"query", "queries of ten million stored events", measureStoredQueries},
     MeasurementGroup{"report", "the report and the list of 100,000 sessions", measureReports},
+    MeasurementGroup{"ingest", "rows of a fleet from the stream into the database", measureIngest},
     MeasurementGroup{"session", "recording a million messages: time and memory", measureGrowingSession},
     MeasurementGroup{"end", "the end of a session of a million messages", measureSessionEnd},
     MeasurementGroup{"ended", "the memory that stays of sessions that ended", measureEndedSessions},

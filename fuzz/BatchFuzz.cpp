@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Batches come from devices that others hold in their hands. For all bytes, as a compressed batch and as its lines,
 // reading must end with a reason or with rows; and what becomes a row of the database must be one line of JSON of its
-// own.
+// own, with a payload that is JSON, too.
 #include "kesto-ingest/batch/Batch.h"
 
 #include <rapidjson/document.h>
@@ -26,10 +26,18 @@ void check(const std::expected<kesto_ingest::Batch, std::string>& batch)
     }
     require(batch->device.size() == 32 && batch->epoch.size() == 32 && !batch->rows.empty());
     for (const kesto_ingest::Row& row : batch->rows) {
-        require(row.json.find('\n') == row.json.size() - 1);
+        const std::string_view json = batch->jsonOf(row);
+        require(json.find('\n') == json.size() - 1);
         rapidjson::Document document;
-        document.Parse<rapidjson::kParseValidateEncodingFlag>(row.json.data(), row.json.size());
+        document.Parse<rapidjson::kParseValidateEncodingFlag>(json.data(), json.size());
         require(document.IsObject() && document.HasMember("device") && document["device"].GetString() == batch->device);
+        require(document.HasMember("payload") == (row.table == kesto_ingest::Table::Events));
+        if (row.table == kesto_ingest::Table::Events) {
+            rapidjson::Document payload;
+            const auto& text = document["payload"];
+            payload.Parse<rapidjson::kParseNumbersAsStringsFlag>(text.GetString(), text.GetStringLength());
+            require(payload.IsObject());
+        }
     }
     require(batch->badRows.size() <= kesto_ingest::mostBadRows);
     for (const kesto_ingest::BadRow& row : batch->badRows)

@@ -135,7 +135,9 @@ bool Ingest::isDue() const
 
 bool Ingest::isFull() const
 {
-    return taking_.rows >= limits_.rows || taking_.bytes >= limits_.bytes;
+    // A busy database gets several inserts in one load: their small ones and their answers are joined, too.
+    const std::size_t inserts = isStoring() ? limits_.insertsOfALoad : 1;
+    return taking_.rows >= inserts * limits_.rows || taking_.bytes >= limits_.bytes;
 }
 
 // A device that is told of a batch forgets what is in the earlier ones, too.
@@ -206,7 +208,7 @@ void Ingest::take(Delivery delivery)
         taking_.bytes += sizeof(BadRow) + row.reason.size() + row.line.size();
     taking_.bytes += delivery.payload.size();
     for (const Row& row : batch->rows)
-        taking_.add(row, limits_.rows);
+        taking_.add(row, batch->jsonOf(row), limits_.rows);
     metrics_.waitingRows += batch->rows.size();
     const Confirmation confirmation = {credential, batch->device, batch->epoch, batch->last, delivery.isRepeated};
     hold({.delivery = std::move(delivery), .badRows = std::move(batch->badRows), .confirmation = confirmation});

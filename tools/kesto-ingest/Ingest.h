@@ -4,7 +4,8 @@
 // Everything that a batch leads to is done before the batch is acknowledged, and all of it may be done twice: rows have
 // keys, dead letters and confirmations too. So a kill at any moment loses nothing.
 //
-// While the database stores one load, the next is taken: reading rows and inserting them need about as much time.
+// While the database stores one load, the next is taken. It may become larger: reading rows is quicker than inserting
+// them.
 #pragma once
 
 #include "kesto-ingest/Load.h"
@@ -29,7 +30,8 @@ namespace kesto_ingest {
 
 struct IngestLimits {
     std::size_t rows = 10'000; // joined into one insert
-    std::size_t bytes = 32 * 1024 * 1024; // the same
+    std::size_t insertsOfALoad = 4; // are taken at the most while the database stores another load
+    std::size_t bytes = 32 * 1024 * 1024; // of a load
     std::chrono::milliseconds joining{1000}; // the longest time that a batch waits for others
     std::chrono::milliseconds shortestPause{500}; // after a failure; doubled with each, up to the longest
     std::chrono::milliseconds longestPause{30'000};

@@ -18,16 +18,16 @@ Counter storedRows(Table table)
 
 } // namespace
 
-void Load::add(const Row& row, std::size_t mostRows)
+void Load::add(const Row& row, std::string_view json, std::size_t mostRows)
 {
     auto place = std::ranges::find_if(blocks, [&row, mostRows](const TableBlock& each) {
         return each.table == row.table && each.block.takes(row.week) && each.block.size() < mostRows;
     });
     if (place == blocks.end())
         place = blocks.insert(place, {.table = row.table, .block = {}});
-    place->block.add(row.json, row.week, batches.size());
+    place->block.add(json, row.week, batches.size());
     ++rows;
-    bytes += row.json.size();
+    bytes += json.size();
 }
 
 std::expected<void, std::string> storeBlocks(Load& load, Database& database, Metrics& metrics)

@@ -12,6 +12,7 @@
 #include <cstddef>
 #include <expected>
 #include <string>
+#include <string_view>
 #include <vector>
 
 namespace kesto_ingest {
@@ -38,7 +39,7 @@ struct Load {
     std::chrono::steady_clock::time_point oldest; // when the first batch came
 
     // Of the batch that comes next into `batches`. No block gets more than `mostRows`.
-    void add(const Row& row, std::size_t mostRows);
+    void add(const Row& row, std::string_view json, std::size_t mostRows);
 };
 
 // Inserts the blocks; a block that is stored is not stored again if a later one fails. The rows that the database

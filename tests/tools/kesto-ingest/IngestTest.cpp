@@ -9,6 +9,8 @@
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <algorithm>
+
 #include <future>
 
 namespace kesto_ingest {
@@ -129,19 +131,30 @@ TEST_F(IngestTest, TakesTheNextLoadWhileTheDatabaseStoresOne)
 
 TEST_F(IngestTest, TakesNoMoreThanOneLoadWhileTheDatabaseStoresOne)
 {
-    ingest = makeIngest({.rows = 2, .joining = milliseconds{0}});
+    ingest = makeIngest({.rows = 2, .insertsOfALoad = 3, .joining = milliseconds{0}});
     isSlow = true;
     send(deviceLine(1, 3) + eventLine(3));
     turns(2);
     for (int id = 4; id <= 9; ++id)
         send(deviceLine(id, id) + eventLine(id));
-    turns(2);
-    EXPECT_EQ(metrics.count(Counter::BatchesTaken), 2U);
+    turns(3);
+    EXPECT_EQ(metrics.count(Counter::BatchesTaken), 4U) << "the second load has six rows";
     endWork();
     turns(2);
     endWork();
     turns(1);
-    EXPECT_EQ(metrics.count(Counter::BatchesStored), 2U);
+    EXPECT_EQ(metrics.count(Counter::BatchesStored), 4U);
+    EXPECT_THAT(database.blocks, SizeIs(6)) << "two, and two of each table";
+    for (const std::string& block : database.blocks)
+        EXPECT_LE(std::ranges::count(block, '\n'), 2);
+}
+
+TEST_F(IngestTest, StoresAtOnceWhatFillsAnInsertIfTheDatabaseIsFree)
+{
+    ingest = makeIngest({.rows = 2, .insertsOfALoad = 3, .joining = milliseconds{1000}});
+    send(deviceLine(1, 3) + eventLine(3));
+    turns(2);
+    EXPECT_THAT(database.tables["events"], SizeIs(1));
 }
 
 TEST_F(IngestTest, StoresNoLoadBeforeAnEarlierOneThatFailed)

@@ -5,41 +5,21 @@
 #include "foundation/values/Microseconds.h"
 #include "foundation/values/String.h"
 #include "kesto-ingest/batch/Compression.h"
+#include "kesto-ingest/batch/JsonText.h"
 #include "kesto-ingest/batch/RowReader.h"
 
 #include <algorithm>
 #include <cstdint>
 #include <fmt/format.h>
-#include <iterator>
 
 namespace kesto_ingest {
 
 namespace {
 
-// Appends what needs no escape at once: that is nearly all.
-void appendText(std::string_view text, std::string& json)
-{
-    json += '"';
-    std::size_t appended = 0;
-    for (std::size_t place = 0; place < text.size(); ++place) {
-        const char character = text[place];
-        const bool isControl = static_cast<unsigned char>(character) < 0x20;
-        if (character != '"' && character != '\\' && !isControl)
-            continue;
-        json += text.substr(appended, place - appended);
-        appended = place + 1;
-        if (isControl)
-            fmt::format_to(std::back_inserter(json), "\\u{:04x}", static_cast<unsigned>(character));
-        else
-            (json += '\\') += character;
-    }
-    json += text.substr(appended);
-    json += '"';
-}
-
 void appendWhole(std::int64_t number, std::string& json)
 {
-    fmt::format_to(std::back_inserter(json), "{}", number);
+    const fmt::format_int text(number);
+    json.append(text.data(), text.size());
 }
 
 // What a partition, and a column of moments, can express.
@@ -51,30 +31,31 @@ double momentOf(const RowReader& row)
     return isKnown ? moment : row.number(kind.otherMoment);
 }
 
+void appendColumnName(std::string_view column, std::string& json)
+{
+    ((json += ",\"") += column) += "\":";
+}
+
 void appendColumn(const Field& field, const RowReader& row, std::string& json)
 {
     const RowEntry* const entry = row.find(field.key);
     if (entry == nullptr || field.column.empty())
         return;
-    json += json.empty() ? "{\"" : ",\"";
-    json += field.column;
-    json += "\":";
+    appendColumnName(field.column, json);
     switch (field.type) {
     case FieldType::Moment:
     case FieldType::Number:
     case FieldType::Identity:
     case FieldType::Integer:
     case FieldType::Count: json += entry->text; break;
-    case FieldType::Length: appendWhole(foundation::wholeMicroseconds(row.number(field.key)), json); break;
-    case FieldType::Share:
-        appendWhole(foundation::wholeMillionths(std::clamp(row.number(field.key), 0.0, 1.0)), json);
-        break;
+    case FieldType::Length: appendWhole(foundation::wholeMicroseconds(entry->number), json); break;
+    case FieldType::Share: appendWhole(foundation::wholeMillionths(std::clamp(entry->number, 0.0, 1.0)), json); break;
     case FieldType::Flag: json += entry->kind == ValueKind::True ? '1' : '0'; break;
     case FieldType::Name: appendText(foundation::cutBetweenCharacters(entry->text, longestName), json); break;
     case FieldType::Digits:
     case FieldType::Label:
-    case FieldType::Text:
-    case FieldType::Object: appendText(entry->text, json); break;
+    case FieldType::Text: appendText(entry->text, json); break;
+    case FieldType::Object: ((json += '"') += entry->text) += '"'; break;
     }
 }
 
@@ -83,6 +64,7 @@ class BatchReader {
 public:
     std::expected<Batch, std::string> read(std::string_view lines)
     {
+        batch_.json.reserve(lines.size() + lines.size() / 2); // enough for most
         while (!lines.empty()) {
             const std::size_t end = lines.find('\n');
             const std::string_view line = lines.substr(0, end);
@@ -107,14 +89,15 @@ private:
             return std::unexpected("its first row is wrong: " + read.error());
         if (row_.kind().table != Table::Batches)
             return std::unexpected("its first row is not of kind device");
-        batch_.device = row_.text("device");
-        batch_.epoch = row_.text("epoch");
-        batch_.last = row_.identity("last");
-        if (row_.identity("first") > batch_.last)
+        batch_.device = row_.text(Key::Device);
+        batch_.epoch = row_.text(Key::Epoch);
+        batch_.last = row_.identity(Key::Last);
+        beginning_ = fmt::format(R"({{"device":"{}","epoch":"{}")", batch_.device, batch_.epoch);
+        if (row_.identity(Key::First) > batch_.last)
             return std::unexpected("its first row names a range that ends before it begins");
-        for (const std::string_view label : {"model", "version"})
+        for (const Key label : {Key::Model, Key::Version})
             if (const std::string_view text = row_.text(label); !text.empty()) {
-                labels_ += fmt::format(",\"{}\":", label);
+                labels_ += fmt::format(",\"{}\":", name(label));
                 appendText(text, labels_);
             }
         isBegun_ = true;
@@ -129,14 +112,14 @@ private:
             batch_.badRows.push_back({read.error(), std::string(line)});
         else if (row_.kind().table == Table::Batches)
             batch_.badRows.push_back({"only the first row is of kind device", std::string(line)});
-        else if (row_.text("device") != batch_.device || row_.text("epoch") != batch_.epoch)
+        else if (row_.text(Key::Device) != batch_.device || row_.text(Key::Epoch) != batch_.epoch)
             batch_.badRows.push_back({"the first row is of another device or epoch", std::string(line)});
         else
             addRow(labels_);
         if (batch_.badRows.size() > mostBadRows)
             return std::unexpected(fmt::format("more than {} of its rows are wrong; of the first, {}", mostBadRows,
                                                batch_.badRows.front().reason));
-        if (written_ > largestRows)
+        if (batch_.json.size() > largestRows)
             return std::unexpected(fmt::format("its rows become more than {} bytes", largestRows));
         return {};
     }
@@ -146,28 +129,29 @@ private:
         constexpr double secondsOfDay = 86400;
         constexpr double secondsOfWeek = 7 * secondsOfDay;
         constexpr double beforeThursday = 3 * 86400; // 1970 began on one
-        Row& row = batch_.rows.emplace_back();
-        row.table = row_.kind().table;
-        const double moment = momentOf(row_);
-        row.week = static_cast<std::uint32_t>((moment + beforeThursday) / secondsOfWeek);
-        if (row_.number("seconds") > secondsOfDay)
-            row.week += weekOfLong;
+        std::string& json = batch_.json;
+        const std::size_t begin = json.size();
+        json += beginning_;
         for (const Field& field : row_.kind().fields)
-            appendColumn(field, row_, row.json);
+            appendColumn(field, row_, json);
+        const double moment = momentOf(row_);
         if (const std::string_view column = row_.kind().microseconds; !column.empty()) {
-            fmt::format_to(std::back_inserter(row.json), ",\"{}\":", column);
-            appendWhole(foundation::wholeMicroseconds(moment), row.json);
+            appendColumnName(column, json);
+            appendWhole(foundation::wholeMicroseconds(moment), json);
         }
-        row.json += labels;
-        row.json += "}\n";
-        written_ += row.json.size();
+        json += labels;
+        json += "}\n";
+        auto week = static_cast<std::uint32_t>((moment + beforeThursday) / secondsOfWeek);
+        if (row_.number(Key::Seconds) > secondsOfDay)
+            week += weekOfLong;
+        batch_.rows.push_back({.table = row_.kind().table, .week = week, .begin = begin, .size = json.size() - begin});
     }
 
     RowReader row_;
     Batch batch_;
     bool isBegun_ = false;
-    std::size_t written_ = 0; // bytes of rows
-    std::string labels_;
+    std::string beginning_; // of every row
+    std::string labels_; // at the end of every row but the first
 };
 
 } // namespace

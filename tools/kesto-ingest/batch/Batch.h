@@ -28,7 +28,8 @@ constexpr std::uint32_t weekOfLong = 1'000'000;
 struct Row {
     Table table;
     std::uint32_t week; // from Monday on, as the partitions of the tables; 1970 begins in week 0. See weekOfLong
-    std::string json; // a line of JSONEachRow, with its end
+    std::size_t begin; // of its line in the JSON of the batch
+    std::size_t size; // with the line's end
 };
 
 struct BadRow {
@@ -41,7 +42,13 @@ struct Batch {
     std::string epoch;
     std::uint64_t last = 0; // the ID up to which the batch tells all that may be told
     std::vector<Row> rows;
+    std::string json; // of all rows: lines of JSONEachRow
     std::vector<BadRow> badRows;
+
+    [[nodiscard]] std::string_view jsonOf(const Row& row) const
+    {
+        return std::string_view(json).substr(row.begin, row.size);
+    }
 };
 
 // The error says why nothing of the batch can be used.

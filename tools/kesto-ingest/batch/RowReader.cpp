@@ -1,23 +1,20 @@
 // SPDX-License-Identifier: Apache-2.0
-// RapidJSON reads the text; the handler keeps the entries of the row, and writes the object inside again without
-// spaces.
+// RapidJSON reads a copy of the line and leaves its texts there, without their escapes; the handler keeps where they
+// are, and writes the payload again without spaces.
 #include "kesto-ingest/batch/RowReader.h"
 
 #include "foundation/values/String.h"
 
 #include <fmt/format.h>
 #include <rapidjson/error/en.h>
-#include <rapidjson/memorystream.h>
 #include <rapidjson/reader.h>
-#include <rapidjson/stringbuffer.h>
-#include <rapidjson/writer.h>
+#include <rapidjson/stream.h>
 
 #include <algorithm>
 #include <charconv>
 #include <cmath>
 #include <limits>
 #include <optional>
-#include <span>
 #include <system_error>
 #include <utility>
 
@@ -34,56 +31,59 @@ template <typename Number> std::optional<Number> numberIn(std::string_view text)
     return error == std::errc() && end == text.data() + text.size() ? std::optional(number) : std::nullopt;
 }
 
+// A line that RapidJSON reads in place. When it begins with a text, what needs no change there is behind it at once.
+class LineStream : public rapidjson::InsituStringStream {
+public:
+    explicit LineStream(std::string& line) : rapidjson::InsituStringStream(line.data()), end_(line.data() + line.size())
+    {
+    }
+
+    char* PutBegin()
+    {
+        char* const begin = src_;
+        src_ += plainLength({src_, end_});
+        dst_ = src_;
+        return begin;
+    }
+
+private:
+    char* end_;
+};
+
 // Called by RapidJSON for each part of the line. A function that returns false stops it.
 class EntryHandler {
 public:
-    EntryHandler(std::span<RowEntry> entries, std::size_t& size) : entries_(entries), size_(size) { }
+    EntryHandler(std::array<RowEntry, keyCount>& entries, EmbeddedJson& payload) : entries_(entries), payload_(payload)
+    {
+    }
 
     [[nodiscard]] const std::string& reason() const noexcept { return reason_; }
 
-    bool Null()
-    {
-        fact_ = nullptr;
-        return isInside() ? writer_.Null() : set(ValueKind::Null, {});
-    }
-    bool Bool(bool value)
-    {
-        note(ValueKind::Number, value ? "1" : "0");
-        return isInside() ? writer_.Bool(value) : set(value ? ValueKind::True : ValueKind::False, {});
-    }
+    bool Null() { return addValue(ValueKind::Null, "null"); }
+    bool Bool(bool value) { return value ? addValue(ValueKind::True, "true") : addValue(ValueKind::False, "false"); }
     bool RawNumber(const char* text, rapidjson::SizeType length, bool)
     {
-        note(ValueKind::Number, {text, length});
-        return isInside() ? writer_.RawValue(text, length, rapidjson::kNumberType)
-                          : set(ValueKind::Number, {text, length});
+        return addValue(ValueKind::Number, {text, length});
     }
     bool String(const char* text, rapidjson::SizeType length, bool)
     {
-        note(ValueKind::Text, {text, length});
-        return isInside() ? writer_.String(text, length) : set(ValueKind::Text, {text, length});
+        return addValue(ValueKind::Text, {text, length});
     }
     bool Key(const char* text, rapidjson::SizeType length, bool)
     {
         const std::string_view key(text, length);
-        if (isInside()) {
-            fact_ = factNamed(key);
-            return writer_.Key(text, length);
+        if (depth_ == 1)
+            return beginEntry(key);
+        if (isInPayload_) {
+            payload_.addKey(key);
+            next_ = depth_ == 2 ? factNamed(key) : nullptr;
         }
-        isIgnored_ = !hasField(key);
-        if (isIgnored_)
-            return true;
-        for (const RowEntry& entry : entries_.first(size_))
-            if (entry.key == key)
-                return refuse(fmt::format("the key {} is there twice", key.substr(0, 64)));
-        if (size_ == entries_.size())
-            return refuse(fmt::format("it has more than {} keys", entries_.size()));
-        entries_[size_++].key = key;
         return true;
     }
-    bool StartObject() { return open(ValueKind::Object) && (depth_ <= 1 || writer_.StartObject()); }
-    bool EndObject(rapidjson::SizeType) { return (depth_ <= 1 || writer_.EndObject()) && close(ValueKind::Object); }
-    bool StartArray() { return open(ValueKind::List) && (depth_ <= 1 || writer_.StartArray()); }
-    bool EndArray(rapidjson::SizeType) { return (depth_ <= 1 || writer_.EndArray()) && close(ValueKind::List); }
+    bool StartObject() { return open(ValueKind::Object, '{'); }
+    bool EndObject(rapidjson::SizeType) { return close('}'); }
+    bool StartArray() { return open(ValueKind::List, '['); }
+    bool EndArray(rapidjson::SizeType) { return close(']'); }
 
     // Numbers come as their text.
     static bool Int(int) { return false; }
@@ -93,86 +93,73 @@ public:
     static bool Double(double) { return false; }
 
 private:
-    // What the payload tells itself, and not an object inside. Booleans are numbers there, as for SQLite, by which
-    // devices read theirs.
-    struct Fact {
-        std::string_view field;
-        ValueKind kind = ValueKind::Null;
-        std::string text{};
-    };
-
-    [[nodiscard]] bool isInside() const noexcept { return depth_ > 1; }
-
-    // Null if it is none, or was told before.
-    Fact* factNamed(std::string_view key)
+    [[nodiscard]] RowEntry* entryOf(std::optional<kesto_ingest::Key> key)
     {
-        if (depth_ != 2 || isIgnored_ || entries_[size_ - 1].key != "payload")
-            return nullptr;
-        const auto fact = std::ranges::find_if(facts_, [key](const Fact& each) {
-            return each.field.substr(std::string_view("payload.").size()) == key && each.kind == ValueKind::Null;
-        });
-        return fact == facts_.end() ? nullptr : &*fact;
+        return key ? &entries_[static_cast<std::size_t>(*key)] : nullptr;
     }
-    void note(ValueKind kind, std::string_view text)
+    bool beginEntry(std::string_view key)
     {
-        if (Fact* const fact = std::exchange(fact_, nullptr)) {
-            fact->kind = kind;
-            fact->text = text;
-        }
-    }
-    // As entries of the row.
-    bool addFacts()
-    {
-        for (Fact& fact : facts_) {
-            if (fact.kind != ValueKind::Null && size_ < entries_.size())
-                entries_[size_++] = {std::string(fact.field), fact.kind, std::move(fact.text)};
-            fact.kind = ValueKind::Null;
-        }
+        const auto known = keyNamed(key);
+        next_ = entryOf(known);
+        if (next_ != nullptr && next_->kind != ValueKind::Absent)
+            return refuse(fmt::format("the key {} is there twice", key));
+        isInPayload_ = known == kesto_ingest::Key::Payload;
         return true;
     }
-
+    // What the payload tells itself, and not an object inside. Null if it is nothing, or was told before.
+    RowEntry* factNamed(std::string_view key)
+    {
+        RowEntry* const fact = entryOf(payloadKeyNamed(key));
+        return fact != nullptr && fact->kind <= ValueKind::Null ? fact : nullptr;
+    }
     bool refuse(std::string reason)
     {
         reason_ = std::move(reason);
         return false;
     }
-    bool set(ValueKind kind, std::string_view text)
+    bool addValue(ValueKind kind, std::string_view text)
     {
         if (depth_ == 0)
             return refuse("it is no JSON object");
-        if (isIgnored_)
-            return true;
-        entries_[size_ - 1].kind = kind;
-        entries_[size_ - 1].text = text;
+        if (isInPayload_ && kind == ValueKind::Text)
+            payload_.addText(text);
+        else if (isInPayload_)
+            payload_.addWord(text);
+        const bool isBoolean = kind == ValueKind::True || kind == ValueKind::False;
+        RowEntry* const entry = std::exchange(next_, nullptr);
+        if (entry != nullptr && isBoolean && depth_ > 1) // numbers there, as for SQLite, by which devices read theirs
+            *entry = {.kind = ValueKind::Number, .text = kind == ValueKind::True ? "1" : "0"};
+        else if (entry != nullptr)
+            *entry = {.kind = kind, .text = text};
         return true;
     }
-    bool open(ValueKind kind)
+    bool open(ValueKind kind, char bracket)
     {
-        fact_ = nullptr;
         if (depth_ == 0 && kind != ValueKind::Object)
             return refuse("it is no JSON object");
         if (++depth_ > deepest)
             return refuse(fmt::format("its objects and lists are nested deeper than {}", deepest));
-        if (depth_ == 2) {
-            buffer_.Clear();
-            writer_.Reset(buffer_);
-        }
+        if (isInPayload_)
+            payload_.open(bracket);
+        RowEntry* const entry = std::exchange(next_, nullptr);
+        if (entry != nullptr && depth_ == 2)
+            entry->kind = kind;
         return true;
     }
-    bool close(ValueKind kind)
+    bool close(char bracket)
     {
-        return --depth_ != 1 || (set(kind, {buffer_.GetString(), buffer_.GetSize()}) && addFacts());
+        const bool isRow = --depth_ == 0;
+        if (isInPayload_ && !isRow)
+            payload_.close(bracket);
+        return true;
     }
 
-    std::span<RowEntry> entries_;
-    std::size_t& size_;
+    std::array<RowEntry, keyCount>& entries_;
+    EmbeddedJson& payload_;
     unsigned depth_ = 0;
-    std::array<Fact, 2> facts_{{{.field = "payload.active_devices"}, {.field = "payload.late_cycles"}}};
-    Fact* fact_ = nullptr; // whose value comes next
-    bool isIgnored_ = false; // the key that was read last, outside of objects and lists
+    RowEntry* next_ = nullptr; // whose value comes next; null: nobody's
+    bool isInPayload_ = false;
     std::string reason_;
-    rapidjson::StringBuffer buffer_;
-    rapidjson::Writer<rapidjson::StringBuffer> writer_{buffer_};
 };
 
 bool isDigits(std::string_view text)
@@ -182,9 +169,11 @@ bool isDigits(std::string_view text)
            });
 }
 
-bool isNumberBetween(const RowEntry& entry, double least, double most)
+// Keeps the number in the entry.
+bool isNumberBetween(RowEntry& entry, double least, double most)
 {
     const auto number = entry.kind == ValueKind::Number ? numberIn<double>(entry.text) : std::nullopt;
+    entry.number = number.value_or(0);
     return number && *number >= least && *number <= most;
 }
 
@@ -194,7 +183,7 @@ template <typename Integer> bool isInteger(const RowEntry& entry)
 }
 
 // What the type demands; empty if the entry has it.
-std::string_view lacking(const RowEntry& entry, FieldType type)
+std::string_view lacking(RowEntry& entry, FieldType type)
 {
     constexpr double largest = std::numeric_limits<double>::max();
     const bool isText = entry.kind == ValueKind::Text;
@@ -220,15 +209,26 @@ std::string_view lacking(const RowEntry& entry, FieldType type)
 
 } // namespace
 
+} // namespace kesto_ingest
+
+template <> struct rapidjson::StreamTraits<kesto_ingest::LineStream> {
+    enum { copyOptimization = 1 }; // as for its base; texts of numbers come only so
+};
+
+namespace kesto_ingest {
+
 std::expected<void, std::string> RowReader::parse(std::string_view line)
 {
-    constexpr unsigned flags = rapidjson::kParseNumbersAsStringsFlag | rapidjson::kParseIterativeFlag;
-    size_ = 0;
+    constexpr unsigned flags = rapidjson::kParseInsituFlag | rapidjson::kParseNumbersAsStringsFlag;
+    for (RowEntry& entry : entries_)
+        entry.kind = ValueKind::Absent;
+    payload_.clear();
     if (!foundation::isValidUtf8(line)) // quicker than RapidJSON's own check of each text
         return std::unexpected("it is no UTF-8");
-    EntryHandler handler(entries_, size_);
+    line_ = line;
+    EntryHandler handler(entries_, payload_);
     rapidjson::Reader reader;
-    rapidjson::MemoryStream stream(line.data(), line.size());
+    LineStream stream(line_);
     const auto result = reader.Parse<flags>(stream, handler);
     if (!handler.reason().empty())
         return std::unexpected(handler.reason());
@@ -237,26 +237,25 @@ std::expected<void, std::string> RowReader::parse(std::string_view line)
                                            rapidjson::GetParseError_En(result.Code())));
     if (stream.Tell() != line.size()) // a NUL ended it
         return std::unexpected("it is no JSON: it has a NUL");
+    entries_[static_cast<std::size_t>(Key::Payload)].text = payload_.content();
     return {};
 }
 
 std::expected<void, std::string> RowReader::checkFields()
 {
-    const auto entries = std::span(entries_).first(size_);
     for (const Field& field : kind_->fields) {
-        const auto place = std::ranges::find(entries, field.key, &RowEntry::key);
-        RowEntry* const entry = place == entries.end() || place->kind == ValueKind::Null ? nullptr : &*place;
-        if (entry == nullptr && field.isRequired)
-            return std::unexpected(fmt::format("the key {} is missing", field.key));
-        if (entry == nullptr)
+        RowEntry& entry = entries_[static_cast<std::size_t>(field.key)];
+        const bool isTold = entry.kind > ValueKind::Null;
+        if (!isTold && field.isRequired)
+            return std::unexpected(fmt::format("the key {} is missing", name(field.key)));
+        if (!isTold)
             continue;
-        const std::string_view what = lacking(*entry, field.type);
+        const std::string_view what = lacking(entry, field.type);
         if (what.empty())
             continue;
-        if (!field.isRequired)
-            entry->kind = ValueKind::Null;
-        else
-            return std::unexpected(fmt::format("{} is not {}", field.key, what));
+        if (field.isRequired)
+            return std::unexpected(fmt::format("{} is not {}", name(field.key), what));
+        entry.kind = ValueKind::Null;
     }
     return {};
 }
@@ -265,7 +264,7 @@ std::expected<void, std::string> RowReader::read(std::string_view line)
 {
     if (auto parsed = parse(line); !parsed)
         return parsed;
-    const RowEntry* const kind = find("kind");
+    const RowEntry* const kind = find(Key::Kind);
     if (kind == nullptr || kind->kind != ValueKind::Text)
         return std::unexpected("it has no kind");
     kind_ = kindNamed(kind->text);
@@ -274,26 +273,19 @@ std::expected<void, std::string> RowReader::read(std::string_view line)
     return checkFields();
 }
 
-const RowEntry* RowReader::find(std::string_view key) const noexcept
-{
-    for (const RowEntry& entry : std::span(entries_).first(size_))
-        if (entry.key == key)
-            return entry.kind == ValueKind::Null ? nullptr : &entry;
-    return nullptr;
-}
-
-std::string_view RowReader::text(std::string_view key) const noexcept
+std::string_view RowReader::text(Key key) const noexcept
 {
     const RowEntry* const entry = find(key);
-    return entry == nullptr ? std::string_view() : std::string_view(entry->text);
+    return entry == nullptr ? std::string_view() : entry->text;
 }
 
-double RowReader::number(std::string_view key) const noexcept
+double RowReader::number(Key key) const noexcept
 {
-    return numberIn<double>(text(key)).value_or(0);
+    const RowEntry* const entry = find(key);
+    return entry == nullptr ? 0 : entry->number;
 }
 
-std::uint64_t RowReader::identity(std::string_view key) const noexcept
+std::uint64_t RowReader::identity(Key key) const noexcept
 {
     return numberIn<std::uint64_t>(text(key)).value_or(0);
 }

@@ -5,9 +5,11 @@
 // Numbers stay the text that they came as, so that none loses a digit on its way.
 #pragma once
 
+#include "kesto-ingest/batch/JsonText.h"
 #include "kesto-ingest/batch/Schema.h"
 
 #include <array>
+#include <cstddef>
 #include <cstdint>
 #include <expected>
 #include <string>
@@ -15,12 +17,12 @@
 
 namespace kesto_ingest {
 
-enum class ValueKind : std::uint8_t { Null, False, True, Number, Text, Object, List };
+enum class ValueKind : std::uint8_t { Absent, Null, False, True, Number, Text, Object, List };
 
 struct RowEntry {
-    std::string key;
-    ValueKind kind = ValueKind::Null;
-    std::string text; // of a number or a text, and the compact JSON of an object
+    ValueKind kind = ValueKind::Absent;
+    std::string_view text; // of a number or a text; of the payload, the content of a text of JSON that holds it
+    double number = 0; // of a field whose type is of real numbers
 };
 
 // One row at a time; it keeps its memory for the next. One thread.
@@ -31,18 +33,25 @@ public:
 
     // Of the row that was read last.
     [[nodiscard]] const RowKind& kind() const noexcept { return *kind_; }
-    // Null if the row does not have the key; the keys are those of the schema.
-    [[nodiscard]] const RowEntry* find(std::string_view key) const noexcept;
-    [[nodiscard]] std::string_view text(std::string_view key) const noexcept;
-    [[nodiscard]] double number(std::string_view key) const noexcept;
-    [[nodiscard]] std::uint64_t identity(std::string_view key) const noexcept;
+    // Null if the row does not have the key.
+    [[nodiscard]] const RowEntry* find(Key key) const noexcept
+    {
+        const RowEntry& entry = entries_[static_cast<std::size_t>(key)];
+        return entry.kind > ValueKind::Null ? &entry : nullptr;
+    }
+    // Empty if the row does not have the key.
+    [[nodiscard]] std::string_view text(Key key) const noexcept;
+    // 0 if the row does not have the key.
+    [[nodiscard]] double number(Key key) const noexcept;
+    [[nodiscard]] std::uint64_t identity(Key key) const noexcept;
 
 private:
     [[nodiscard]] std::expected<void, std::string> parse(std::string_view line);
     [[nodiscard]] std::expected<void, std::string> checkFields();
 
-    std::array<RowEntry, mostFields> entries_;
-    std::size_t size_ = 0;
+    std::array<RowEntry, keyCount> entries_; // by key; their texts are in the next two
+    std::string line_; // as parsing it has changed it
+    EmbeddedJson payload_;
     const RowKind* kind_ = nullptr;
 };
 

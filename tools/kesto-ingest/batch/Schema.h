@@ -4,6 +4,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <optional>
 #include <span>
 #include <string_view>
 
@@ -25,26 +26,59 @@ enum class FieldType : std::uint8_t {
     Object // JSON
 };
 
+// Of all kinds of rows together.
+enum class Key : std::uint8_t {
+    Device,
+    Epoch,
+    Kind,
+    Model,
+    Version,
+    Sent,
+    First,
+    Last,
+    Id,
+    Time,
+    Name,
+    Payload,
+    Session,
+    Happened,
+    Application,
+    Recording,
+    Began,
+    Seconds,
+    DeviceName,
+    Format,
+    Channels,
+    Volume,
+    Ending,
+    Reporter,
+    Service,
+    Process,
+    Ended,
+    ActiveDevices, // the payload's own, as the next
+    LateCycles
+};
+constexpr std::size_t keyCount = static_cast<std::size_t>(Key::LateCycles) + 1;
+
 enum class Table : std::uint8_t { Batches, Events, Stretches, Sessions };
 constexpr std::size_t tableCount = 4;
 
 struct Field {
-    std::string_view key; // "payload.KEY" is one of the payload's own keys
+    Key key;
     FieldType type;
     bool isRequired; // if not, a value that does not fit is left out
-    std::string_view column; // empty: it is no column
+    std::string_view column; // empty: it is none, or one with which every row begins
 };
 
 struct RowKind {
     std::string_view name;
     Table table;
-    std::string_view moment; // the key of the moment whose week chooses the partition
-    std::string_view otherMoment; // the key in its place, if that is not told or no date can express it
+    Key moment; // its week chooses the partition
+    Key otherMoment; // in its place, if that is not told or no date can express it; or the same
     std::string_view microseconds; // the column that has this moment in whole microseconds; empty: none
     std::span<const Field> fields;
 };
 
-constexpr std::size_t mostFields = 32; // of all kinds together
 constexpr std::size_t longestLabel = 128;
 constexpr std::size_t longestText = 16 * 1024;
 constexpr std::size_t longestName = 256;
@@ -53,7 +87,10 @@ constexpr double latestMoment = 4'294'967'295; // the end of 32 bits
 [[nodiscard]] std::string_view name(Table table) noexcept;
 // Null if there is none of that name.
 [[nodiscard]] const RowKind* kindNamed(std::string_view name) noexcept;
-// Of any kind.
-[[nodiscard]] bool hasField(std::string_view key) noexcept;
+[[nodiscard]] std::string_view name(Key key) noexcept;
+// A key of a row; none if no kind has it.
+[[nodiscard]] std::optional<Key> keyNamed(std::string_view name) noexcept;
+// One of the payload's own keys that rows tell, too.
+[[nodiscard]] std::optional<Key> payloadKeyNamed(std::string_view name) noexcept;
 
 } // namespace kesto_ingest

@@ -7,6 +7,7 @@
 
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
+#include <rapidjson/document.h>
 
 namespace kesto_ingest {
 namespace {
@@ -21,6 +22,12 @@ Batch batchOf(const std::string& lines)
     auto batch = readLines(lines);
     EXPECT_TRUE(batch) << batch.error();
     return batch.value_or(Batch());
+}
+
+// The row at this place, as it is written for the database.
+std::string jsonOf(const Batch& batch, std::size_t place)
+{
+    return std::string(batch.jsonOf(batch.rows.at(place)));
 }
 
 // Why this row is refused behind a good first one; empty if it is not.
@@ -56,7 +63,7 @@ TEST(Batch, TellsWhoseItIs)
 TEST(Batch, TellsDevicesAndCyclesOfAPayloadItself)
 {
     const auto factsOf = [](std::string_view payload) {
-        const std::string json = batchOf(deviceLine(3, 9) + eventLine(3, deviceA, payload)).rows.at(1).json;
+        const std::string json = jsonOf(batchOf(deviceLine(3, 9) + eventLine(3, deviceA, payload)), 1);
         const std::size_t begins = json.find("\",\"", json.find("\"payload\":")) + 2;
         return json.substr(begins, json.find("\"session\"") - begins);
     };
@@ -77,31 +84,42 @@ TEST(Batch, BecomesRowsWithTheColumnsOfTheirTables)
     ASSERT_THAT(batch.rows, SizeIs(4));
     EXPECT_EQ(batch.rows[0].table, Table::Batches);
     EXPECT_EQ(
-        batch.rows[0].json,
+        jsonOf(batch, 0),
         R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","model":"lamp",)"
         R"("version":"1.2","sent":1795264600.5,"first_id":3,"last_id":9})"
         "\n");
     EXPECT_EQ(batch.rows[1].table, Table::Events);
     EXPECT_EQ(
-        batch.rows[1].json,
+        jsonOf(batch, 1),
         R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":3,)"
         R"("time":1795264505.66,"name":"com.quarn.kesto.Error.IssueDetector","payload":"{\"late_cycles\":3}",)"
         R"("late_cycles":3,"session":7,"application":"player","happened_us":1795264505660000,"model":"lamp","version":"1.2"})"
         "\n");
     EXPECT_EQ(batch.rows[2].table, Table::Stretches);
-    EXPECT_EQ(batch.rows[2].json,
+    EXPECT_EQ(jsonOf(batch, 2),
               R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":4,)"
               R"("recording":0,"microseconds":12500000,"session":7,"audio_device":"headset","channels":2,)"
               R"("volume_millionths":500000,"application":"player","ending":"stopped","began_us":1795264500250000,)"
               R"("model":"lamp","version":"1.2"})"
               "\n");
     EXPECT_EQ(batch.rows[3].table, Table::Sessions);
-    EXPECT_EQ(batch.rows[3].json,
+    EXPECT_EQ(jsonOf(batch, 3),
               R"({"device":"0123456789abcdef0123456789abcdef","epoch":"00000000000000000000000000000001","id":7,)"
               R"("reporter":-5,"application":"player","began":1795264400,"ended":1795264600.125,"model":"lamp",)"
               R"("version":"1.2"})"
               "\n");
     EXPECT_EQ(batch.rows[1].week, 2968U); // 1795264505 s and three days are 2968.8 weeks
+}
+
+TEST(Batch, PutsTextsInTheColumnsOfTheirKeys)
+{
+    std::string stretch = stretchLine(4);
+    stretch.replace(stretch.find(R"("application")"), 0, R"("format":"S16LE",)");
+    std::string session = sessionLine(7, "");
+    session.replace(session.find(R"("application")"), 0, R"("service":"media","process":"mpv",)");
+    const Batch batch = batchOf(deviceLine(1, 9) + stretch + session);
+    EXPECT_THAT(jsonOf(batch, 1), HasSubstr(R"("audio_device":"headset","format":"S16LE","channels":2,)"));
+    EXPECT_THAT(jsonOf(batch, 2), HasSubstr(R"("service":"media","application":"player","process":"mpv","began":)"));
 }
 
 TEST(Batch, RoundsMomentsToMicrosecondsAndVolumesToMillionths)
@@ -119,12 +137,12 @@ TEST(Batch, RoundsMomentsToMicrosecondsAndVolumesToMillionths)
                                 + eventWith(R"("happened":604800,"id":7,)", R"("id":5,)"));
     EXPECT_THAT(batch.badRows, IsEmpty());
     ASSERT_THAT(batch.rows, SizeIs(6));
-    EXPECT_THAT(batch.rows[1].json, HasSubstr(R"("microseconds":2,)")); // of two that are as near, the even one
-    EXPECT_THAT(batch.rows[1].json, HasSubstr(R"("began_us":1795264505660000,)"));
-    EXPECT_THAT(batch.rows[2].json, HasSubstr(R"("microseconds":4294967295000000,)"));
-    EXPECT_THAT(batch.rows[3].json, HasSubstr(R"("happened_us":1795264500123457,)"));
-    EXPECT_THAT(batch.rows[4].json, HasSubstr(R"("happened_us":1795264505660000,)")); // no date expresses what it told
-    EXPECT_THAT(batch.rows[5].json, HasSubstr(R"("happened_us":604800000000,)"));
+    EXPECT_THAT(jsonOf(batch, 1), HasSubstr(R"("microseconds":2,)")); // of two that are as near, the even one
+    EXPECT_THAT(jsonOf(batch, 1), HasSubstr(R"("began_us":1795264505660000,)"));
+    EXPECT_THAT(jsonOf(batch, 2), HasSubstr(R"("microseconds":4294967295000000,)"));
+    EXPECT_THAT(jsonOf(batch, 3), HasSubstr(R"("happened_us":1795264500123457,)"));
+    EXPECT_THAT(jsonOf(batch, 4), HasSubstr(R"("happened_us":1795264505660000,)")); // no date expresses what it told
+    EXPECT_THAT(jsonOf(batch, 5), HasSubstr(R"("happened_us":604800000000,)"));
     EXPECT_EQ(batch.rows[5].week, 1U);
     EXPECT_EQ(batch.rows[1].week, 2968U);
     EXPECT_EQ(batch.rows[2].week, 1'000'000U); // longer than a day
@@ -132,7 +150,7 @@ TEST(Batch, RoundsMomentsToMicrosecondsAndVolumesToMillionths)
     const auto volume = [](std::string_view text) {
         std::string line = stretchLine(4);
         line.replace(line.find(R"("volume":0.5)"), 12, fmt::format(R"("volume":{})", text));
-        const std::string json = batchOf(deviceLine(1, 9) + line).rows.at(1).json;
+        const std::string json = jsonOf(batchOf(deviceLine(1, 9) + line), 1);
         const std::size_t place = json.find("volume_millionths") + 19;
         return json.substr(place, json.find(',', place) - place);
     };
@@ -147,8 +165,54 @@ TEST(Batch, KeepsPayloadsAsTheyAre)
     const std::string payload = R"({ "a": [1.10, 1e2, -0, 0.30000000000000004, true, null, {"b": "\u00e9\n\""}] })";
     const Batch batch = batchOf(deviceLine(1, 9) + eventLine(5, deviceA, payload));
     ASSERT_THAT(batch.rows, SizeIs(2));
-    EXPECT_THAT(batch.rows[1].json,
+    EXPECT_THAT(jsonOf(batch, 1),
                 HasSubstr(R"("payload":"{\"a\":[1.10,1e2,-0,0.30000000000000004,true,null,{\"b\":\"é\\n\\\"\"}]}")"));
+}
+
+// RapidJSON's own reader finds in the column what it finds in the payload as it came.
+TEST(Batch, WritesPayloadsThatAreReadAsTheyCame)
+{
+    std::string characters;
+    for (int code = 0; code < 0x20; ++code)
+        characters += fmt::format("\\u{:04x}", code);
+    for (const std::string& payload : {
+             fmt::format(R"({{"{0}":"{0}","plain":"12345678{0}12345678"}})", characters),
+             std::string(R"({"\"":"\\\/","":"","é":"\ud83d\ude00 日本","{[:":["{",":",",","[","\\"]})"),
+             std::string(
+                 " { \"a\" : [ ] , \t\"b\" : { } , \"c\" : [ [ ] , { } , 1 , -2.5E-7 , true , false , null ] } "),
+             std::string(R"({"a":{"payload":{"b":[{},{"c":[[1,2],[3]]}]}},"d":"x"})"),
+         }) {
+        const std::string json = jsonOf(batchOf(deviceLine(1, 9) + eventLine(5, deviceA, payload)), 1);
+        rapidjson::Document row;
+        row.Parse(json.data(), json.size());
+        ASSERT_FALSE(row.HasParseError()) << json;
+        rapidjson::Document came;
+        rapidjson::Document written;
+        came.Parse(payload.data(), payload.size());
+        written.Parse(row["payload"].GetString(), row["payload"].GetStringLength());
+        ASSERT_FALSE(came.HasParseError()) << payload;
+        EXPECT_TRUE(written == came) << payload << " became " << row["payload"].GetString();
+    }
+}
+
+// Also where eight bytes are looked at together.
+TEST(Batch, EscapesTextsWhereverTheyNeedIt)
+{
+    for (std::size_t before = 0; before < 18; ++before) {
+        const std::string plain(before, 'x');
+        const auto applicationOf = [&plain](std::string_view escape) {
+            const Batch batch = batchOf(deviceLine(1, 9) + eventWith(fmt::format("{}{}y", plain, escape), "player"));
+            const std::string json = jsonOf(batch, 1);
+            const std::size_t begin = json.find("\"application\":") + 14;
+            return json.substr(begin, json.find(",\"happened_us\"") - begin);
+        };
+        EXPECT_EQ(applicationOf(R"(\")"), "\"" + plain + R"(\"y")");
+        EXPECT_EQ(applicationOf(R"(\\)"), "\"" + plain + R"(\\y")");
+        EXPECT_EQ(applicationOf(R"(\n)"), "\"" + plain + R"(\u000ay")");
+        EXPECT_EQ(applicationOf(R"(\u001f)"), "\"" + plain + R"(\u001fy")");
+        EXPECT_EQ(applicationOf(" !#[]\x7fé"), "\"" + plain + " !#[]\x7féy\"");
+    }
+    EXPECT_EQ(reasonOf(eventWith("\x1f", "player")).substr(0, 24), "it is no JSON from byte ");
 }
 
 TEST(Batch, PutsAsideWrongRowsOnly)
@@ -207,7 +271,7 @@ TEST(Batch, IgnoresKeysThatItDoesNotKnow)
         more += fmt::format(R"("new {}":{{"a":[1,{{"id":9}}]}},)", key);
     const Batch batch = batchOf(deviceLine(1, 9) + eventWith(more + R"("colour":7,"colour":7,"id":5,)", R"("id":5,)"));
     ASSERT_THAT(batch.rows, SizeIs(2));
-    EXPECT_EQ(batch.rows[1].json, batchOf(deviceLine(1, 9) + eventLine(5)).rows[1].json);
+    EXPECT_EQ(jsonOf(batch, 1), jsonOf(batchOf(deviceLine(1, 9) + eventLine(5)), 1));
 }
 
 // As a device sends them whose rules turn a number into a range, and a text into a hash.
@@ -222,10 +286,10 @@ TEST(Batch, LeavesOutOptionalValuesThatDoNotFit)
                 + eventWith(std::string(16 * 1024 + 1, 'x'), "player"));
     EXPECT_THAT(batch.badRows, IsEmpty());
     ASSERT_THAT(batch.rows, SizeIs(5));
-    EXPECT_THAT(batch.rows[1].json, HasSubstr(R"("audio_device":"headset","application":"player","ending":"stopped")"));
-    EXPECT_THAT(batch.rows[2].json, HasSubstr(R"("id":7,"application":"player","began":1795264400,)"));
-    EXPECT_THAT(batch.rows[3].json, Not(HasSubstr(R"("happened":)")));
-    EXPECT_THAT(batch.rows[4].json, Not(HasSubstr("application")));
+    EXPECT_THAT(jsonOf(batch, 1), HasSubstr(R"("audio_device":"headset","application":"player","ending":"stopped")"));
+    EXPECT_THAT(jsonOf(batch, 2), HasSubstr(R"("id":7,"application":"player","began":1795264400,)"));
+    EXPECT_THAT(jsonOf(batch, 3), Not(HasSubstr(R"("happened":)")));
+    EXPECT_THAT(jsonOf(batch, 4), Not(HasSubstr("application")));
 }
 
 TEST(Batch, TakesPayloadsThatAreAsDeepAsDevicesSendThem)
@@ -238,9 +302,9 @@ TEST(Batch, HasShortLabels)
 {
     std::string first = deviceLine(1, 9);
     first.replace(first.find("lamp"), 4, std::string(128, 'x'));
-    EXPECT_THAT(batchOf(first).rows[0].json, HasSubstr("\"model\":\"" + std::string(128, 'x') + "\""));
+    EXPECT_THAT(jsonOf(batchOf(first), 0), HasSubstr("\"model\":\"" + std::string(128, 'x') + "\""));
     first.insert(first.find("xxx"), "x");
-    EXPECT_THAT(batchOf(first).rows[0].json, Not(HasSubstr("model")));
+    EXPECT_THAT(jsonOf(batchOf(first), 0), Not(HasSubstr("model")));
 }
 
 TEST(Batch, IsRefusedIfItsRowsBecomeTooLarge)

@@ -101,7 +101,7 @@ TEST(ClickHouseTables, HoldWhatRowsTell)
                   + stretchLine(4) + sessionLine(7, "") + sessionLine(7, "1795264600.125") + sessionLine(7, ""));
     ASSERT_TRUE(batch);
     for (const Row& row : batch->rows)
-        EXPECT_EQ(provider.database().insert(name(row.table), row.json), InsertAnswer());
+        EXPECT_EQ(provider.database().insert(name(row.table), batch->jsonOf(row)), InsertAnswer());
     EXPECT_EQ(
         server.select("SELECT device, epoch, id, time, happened, name, session, application, model, version, payload, "
                       "audio_device, late_cycles, happened_us FROM events FORMAT CSV"),
@@ -123,7 +123,7 @@ TEST(ClickHouseTables, HoldWhatRowsTell)
               "\"('2026-11-16',0)\"\n\"2026-11-16\"");
 
     // A row that comes twice stays once, and a clock that is wrong makes no error.
-    EXPECT_EQ(provider.database().insert("stretches", batch->rows[2].json), InsertAnswer());
+    EXPECT_EQ(provider.database().insert("stretches", batch->jsonOf(batch->rows[2])), InsertAnswer());
     EXPECT_EQ(server.select("SELECT count() FROM stretches FINAL"), "1");
     for (const std::string_view time : {"0", "500000", "86400000000", "4294967295000000"})
         EXPECT_EQ(

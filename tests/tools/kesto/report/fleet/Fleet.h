@@ -29,7 +29,7 @@ protected:
         EXPECT_TRUE(batch.badRows.empty()) << batch.badRows.front().reason;
         std::map<std::string_view, std::string> rows;
         for (const kesto_ingest::Row& row : batch.rows)
-            rows[kesto_ingest::name(row.table)] += row.json;
+            rows[kesto_ingest::name(row.table)] += batch.jsonOf(row);
         for (const auto& [table, text] : rows)
             EXPECT_EQ(database.insert(table, text), kesto_ingest::InsertAnswer());
     }
