@@ -3,6 +3,7 @@
 // with rows that come twice, with names that are made to harm, and with a database that it cannot ask.
 #include "kesto-ingest/MetricsServer.h"
 #include "kesto/report/fleet/FleetQueries.h"
+#include "kesto/report/fleet/SqlText.h"
 #include "kesto/store/EventDatabase.h"
 #include "support/KeptPort.h"
 #include "tools/kesto/report/fleet/Fleet.h"
