@@ -29,7 +29,8 @@ const std::string figures =
     fmt::format("sum(us) AS played, sumIf(us, v = 0) AS muted, sumIf(us, v < 0) AS untold, {} AS volume", volumeSum);
 constexpr std::string_view sumsOfUnit =
     "sum(played) AS played, sum(muted) AS muted, sum(untold) AS untold, sum(volume) AS volume, sum(faults) AS faults,"
-    " sum(sessions) AS sessions, sum(vanished) AS vanished, sum(counted) AS counted, sum(different) AS different";
+    " sum(sessions) AS sessions, sum(vanished) AS vanished, sum(counted) AS counted, sum(different) AS different,"
+    " sum(unwrapped) AS unwrapped";
 constexpr std::string_view sumsOfFigures = "sum(played), sum(muted), sum(untold), sum(volume), sum(faults)";
 // As Played::faultsAnHour works it out.
 constexpr std::string_view faultsAnHour = "faults * 3600 / (played / 1000000)";
@@ -338,17 +339,19 @@ std::string FleetQueries::all() const
 {
     std::string parts = fmt::format(
         "SELECT any(u) AS unit, {}, materialize(toUInt64(0)) AS faults, uniqExact(n) AS sessions,"
-        " uniqExactIf(n, gone) AS vanished, count() AS counted, uniqExact(toUInt32(r)) AS different FROM ({})"
+        " uniqExactIf(n, gone) AS vanished, count() AS counted, uniqExact(toUInt32(r)) AS different,"
+        " sum(toFloat64(us)) AS unwrapped FROM ({})"
         " GROUP BY k",
         figures, onceEach(fmt::format("ends - begins AS us, {} AS k", storeHash), ""));
     if (hasFaults_)
         parts += fmt::format(" UNION ALL SELECT u AS unit, {0} AS played, {0} AS muted, {0} AS untold, {0} AS volume,"
-                             " count() AS faults, {1} AS sessions, {1} AS vanished, {1} AS counted, {1} AS different"
+                             " count() AS faults, {1} AS sessions, {1} AS vanished, {1} AS counted, {1} AS different,"
+                             " materialize(toFloat64(0)) AS unwrapped"
                              " FROM ({2}) GROUP BY unit",
                              "materialize(toInt64(0))", "materialize(toUInt64(0))", faults(needsDevices("")));
     const std::string floor = isAboveFloor();
     return fmt::format(
-        "SELECT {0}, sum(sessions), sum(vanished), countIf(played > 0), {1}, countIf({2}), {3}, sum(toFloat64(played)),"
+        "SELECT {0}, sum(sessions), sum(vanished), countIf(played > 0), {1}, countIf({2}), {3}, sum(unwrapped),"
         " groupArrayIf({4})(toString(unit), counted != different), arrayMap(x -> toString(x.2),"
         " arraySlice(arrayReverseSort(groupArrayIf(({5}, unit), faults > 0 AND {2})), 1, 10))"
         " FROM (SELECT unit, {6} FROM ({7}) GROUP BY unit)",
