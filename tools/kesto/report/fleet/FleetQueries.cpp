@@ -120,19 +120,20 @@ std::string FleetQueries::anyFault() const
 std::string FleetQueries::faults(bool withDevices) const
 {
     const HistoryQuestion& asked = question_.history;
-    std::string each = fmt::format(
-        "SELECT {} AS u, {} AS st, {} AS s, id, device AS unit, epoch, session, happened_us AS happened,"
-        " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
-        " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM (SELECT device, epoch, id,"
-        " session, happened_us, name, application, audio_device, model, version, late_cycles FROM events"
-        " WHERE {} AND received < toDateTime({}) {}) WHERE 1{}{}",
-        unitHash, storeHash, sessionHash, faultPrefix.size() + 1, isFault(), present_, lastOfEvent,
-        matching("application", asked.applications), direction_);
+    std::string each =
+        fmt::format("SELECT {} AS u, {} AS st, {} AS s, id, device AS unit, epoch, session, happened_us AS happened,"
+                    " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
+                    " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM (SELECT device, epoch, id,"
+                    " session, happened_us, name, application, audio_device, model, version, late_cycles FROM events"
+                    " WHERE {} AND received < toDateTime({}) {}) WHERE 1{}{}",
+                    unitHash, storeHash, sessionHash, faultPrefix.size() + 1, isFault(), present_, lastOfEvent,
+                    matching("application", asked.applications), direction_);
     if (!withDevices)
         return each;
     return fmt::format(
         "SELECT * FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late,"
-        " if(named = '', played_on, named) AS device, played_as AS format FROM ({}) ANY LEFT JOIN ({}) USING (st, id)) WHERE 1{}",
+        " if(named = '', played_on, named) AS device, played_as AS format FROM ({}) ANY LEFT JOIN ({}) USING (st, id)) "
+        "WHERE 1{}",
         each, placesOfFaults(), matching("device", asked.devices));
 }
 
@@ -142,7 +143,8 @@ std::string FleetQueries::faults(bool withDevices) const
 std::string FleetQueries::placesOfFaults() const
 {
     const std::string both = fmt::format(
-        "SELECT {0} AS st, session, began_us AS moment, materialize(toUInt8(1)) AS played, id, audio_device AS played_on,"
+        "SELECT {0} AS st, session, began_us AS moment, materialize(toUInt8(1)) AS played, id, audio_device AS "
+        "played_on,"
         " format AS played_as FROM stretches WHERE recording = {1} AND {2} AND (st, session) GLOBAL IN ({3}) UNION ALL"
         " SELECT {0} AS st, session, happened_us AS moment, materialize(toUInt8(0)) AS played, id,"
         " materialize('') AS played_on, materialize('') AS played_as FROM events WHERE {4} AND session != 0{5}",
@@ -337,12 +339,12 @@ std::string isAboveFloor()
 // there twice: what only seems so is chosen once, too.
 std::string FleetQueries::all() const
 {
-    std::string parts = fmt::format(
-        "SELECT any(u) AS unit, {}, materialize(toUInt64(0)) AS faults, uniqExact(n) AS sessions,"
-        " uniqExactIf(n, gone) AS vanished, count() AS counted, uniqExact(toUInt32(r)) AS different,"
-        " sum(toFloat64(us)) AS unwrapped FROM ({})"
-        " GROUP BY k",
-        figures, onceEach(fmt::format("ends - begins AS us, {} AS k", storeHash), ""));
+    std::string parts =
+        fmt::format("SELECT any(u) AS unit, {}, materialize(toUInt64(0)) AS faults, uniqExact(n) AS sessions,"
+                    " uniqExactIf(n, gone) AS vanished, count() AS counted, uniqExact(toUInt32(r)) AS different,"
+                    " sum(toFloat64(us)) AS unwrapped FROM ({})"
+                    " GROUP BY k",
+                    figures, onceEach(fmt::format("ends - begins AS us, {} AS k", storeHash), ""));
     if (hasFaults_)
         parts += fmt::format(" UNION ALL SELECT u AS unit, {0} AS played, {0} AS muted, {0} AS untold, {0} AS volume,"
                              " count() AS faults, {1} AS sessions, {1} AS vanished, {1} AS counted, {1} AS different,"

@@ -28,7 +28,8 @@ const std::set<std::string, std::less<>> ofDeviceOnly{"running", "overlapping", 
 
 // What a device's own report does not have.
 const std::set<std::string, std::less<>> ofFleetOnly{
-    "units", "units_compared", "hours_of_units", "faults_an_hour_of_units", "models", "versions", "worst_units", "unit"};
+    "units",  "units_compared", "hours_of_units", "faults_an_hour_of_units",
+    "models", "versions",       "worst_units",    "unit"};
 
 // What of the device's report the fleet's does not have, or has otherwise; a line each. Numbers are compared as text.
 std::string differences(const std::string& place, const Value& own, const Value& ofFleet)
@@ -111,9 +112,7 @@ TEST_P(EqualReports, AreEqualToTheLastDigit)
         expectEqual(store, unit, with(whole, {"--recording"}));
     }
     for (const char* const figure : {"sessions", "faults", "vanished"}) {
-        const auto of = [&](const Tool::Arguments& more) {
-            return json(with(whole, more)).find(figure)->asDouble();
-        };
+        const auto of = [&](const Tool::Arguments& more) { return json(with(whole, more)).find(figure)->asDouble(); };
         EXPECT_EQ(of({}), of({"--unit", unitA}) + of({"--unit", unitB})) << figure;
     }
     expectEqual(storeA, unitA, {"--since", at(3, 4711), "--until", at(9, 1234)});

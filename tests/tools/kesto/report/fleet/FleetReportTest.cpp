@@ -443,8 +443,8 @@ TEST_F(FleetReports, FindTheDevicesOfManyFaultsOfOneSession)
     FleetQueries queries({.history = {.span = {.from = monday, .until = monday + week}}},
                          {static_cast<std::int64_t>(monday * 1e6), static_cast<std::int64_t>((monday + week) * 1e6)});
     queries.setRecordings({});
-    for (const auto& [by, lines] : {std::pair("audio_device", "left\t20000\nright\t40000"),
-                                    std::pair("format", "F32\t40000\nS16\t20000")})
+    for (const auto& [by, lines] :
+         {std::pair("audio_device", "left\t20000\nright\t40000"), std::pair("format", "F32\t40000\nS16\t20000")})
         EXPECT_EQ(server.select(fmt::format("SELECT name, faults FROM (SELECT name, `sum(faults)` AS faults FROM ({}))"
                                             " ORDER BY name SETTINGS max_memory_usage = 400000000",
                                             queries.lines(by, {.withOverUnits = true}, 0))),
