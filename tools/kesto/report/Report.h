@@ -61,6 +61,7 @@ struct ReportLine {
     std::string key;
     Played played;
     std::optional<OverUnits> overUnits = {}; // of a fleet, if it was asked for
+    std::size_t others = 0; // of a fleet, in the last line: all that follow, so many, without their sessions
 };
 
 // A day of the reader: from one moment of the clock on the wall to the same of the next day, 23 or 25 hours where

@@ -107,19 +107,22 @@ std::optional<ReportBy> chosenTable(const ReportOptions& options)
     return chosen == allTables.end() ? std::nullopt : std::optional(*chosen);
 }
 
-// What the chosen output shows.
+// What the chosen output shows. People do not read longer tables; programs get all lines.
 FleetParts partsOf(const ReportOptions& options)
 {
+    constexpr std::size_t mostForPeople = 1000;
+    const auto chosen = chosenTable(options);
+    FleetParts parts{.tables = {ReportBy::Day, ReportBy::Application}};
     if (options.isJson || options.page)
-        return {.tables = {allTables.begin(), allTables.end() - 1},
-                .withOverUnits = true,
-                .withWorst = true,
-                .withDaysOfLines = options.page.has_value()};
-    if (const auto chosen = chosenTable(options))
-        return {.tables = {*chosen}, .withOverUnits = options.isCsv || *chosen != ReportBy::Day};
-    if (options.isCsv)
-        return {.tables = {ReportBy::Day}, .withOverUnits = true};
-    return {.tables = {ReportBy::Day, ReportBy::Application}};
+        parts.tables = {allTables.begin(), allTables.end() - 1};
+    else if (chosen || options.isCsv)
+        parts.tables = {chosen.value_or(ReportBy::Day)};
+    parts.mostLines = options.isJson || options.isCsv ? 0 : mostForPeople;
+    parts.withSessions = options.isJson || options.isCsv || options.page;
+    parts.withOverUnits = parts.withSessions || chosen;
+    parts.withWorst = options.isJson || options.page;
+    parts.withDaysOfLines = options.page.has_value();
+    return parts;
 }
 
 Report reportOf(ReportOptions& options)

@@ -25,6 +25,12 @@ const std::vector<ReportLine>& linesOf(const Report& report, ReportBy by)
     }
 }
 
+std::size_t numberOf(const std::vector<ReportLine>& lines)
+{
+    const std::size_t others = lines.empty() ? 0 : lines.back().others;
+    return lines.size() + (others == 0 ? 0 : others - 1);
+}
+
 std::vector<VolumeStep> volumeSteps(const Report& report)
 {
     std::vector<VolumeStep> steps;

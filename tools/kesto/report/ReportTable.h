@@ -20,6 +20,9 @@ enum class ReportBy : std::uint8_t { Day, Application, Device, Volume, Format, F
 // units.
 [[nodiscard]] const std::vector<ReportLine>& linesOf(const Report& report, ReportBy by);
 
+// How many lines there are, with those for which the last one may stand.
+[[nodiscard]] std::size_t numberOf(const std::vector<ReportLine>& lines);
+
 // The time at a step of the slider.
 struct VolumeStep {
     double upTo = 0; // with it

@@ -221,11 +221,13 @@ private:
         Table table(head, std::move(columns));
         const std::size_t shown = isAlone ? all.size() : std::min(all.size(), mostLines);
         double rest = 0;
+        std::size_t left = 0;
         for (std::size_t index = 0; index < all.size(); ++index) {
             const Played& played = all[index].played;
             const auto volume = played.meanVolume();
-            if (index >= shown) {
+            if (index >= shown || all[index].others != 0) {
                 rest += played.seconds;
+                left += std::max<std::size_t>(all[index].others, 1);
                 continue;
             }
             std::vector<std::string> figures{durationText(played.seconds), shareText(played.seconds),
@@ -236,9 +238,10 @@ private:
             table.add({keyText(all[index].key), std::move(figures), played.seconds});
         }
         std::string text = table.text(layout_);
-        if (shown < all.size())
-            text += fmt::format("and {} more with {}: --by {} shows all\n", all.size() - shown, durationText(rest),
-                                name(by));
+        if (left != 0)
+            text += fmt::format("and {} more with {}: {} shows {}\n", left, durationText(rest),
+                                isAlone ? "--csv" : fmt::format("--by {}", name(by)),
+                                all.back().others == 0 || isAlone ? "all" : "more");
         return text;
     }
 
@@ -284,11 +287,16 @@ private:
     [[nodiscard]] std::string faults() const
     {
         Table table("FAULT", {{"FAULTS", 7}, {"SESSIONS", 8}});
+        std::string more;
         for (const ReportLine& line : report_.faultKinds)
-            table.add({keyText(line.key),
-                       {fmt::format("{}", line.played.faults), fmt::format("{}", line.played.sessions)},
-                       static_cast<double>(line.played.faults)});
-        return table.text(layout_);
+            if (line.others != 0)
+                more = fmt::format("and {} more with {}: --csv shows all\n", line.others,
+                                   countText(line.played.faults, "fault"));
+            else
+                table.add({keyText(line.key),
+                           {fmt::format("{}", line.played.faults), fmt::format("{}", line.played.sessions)},
+                           static_cast<double>(line.played.faults)});
+        return table.text(layout_) + more;
     }
 
     [[nodiscard]] std::string notes() const

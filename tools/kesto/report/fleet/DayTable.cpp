@@ -9,17 +9,18 @@ namespace {
 
 constexpr std::int64_t microsecondsADay = 86'400'000'000;
 
-// The number of the run in which a figure is, by what each run begins with. Few runs are compared one by one, which is
-// quicker.
-std::string runOf(std::string_view figure, const std::vector<std::int64_t>& beginnings, std::string_view name)
+// The number of the run in which a figure is, by what each run begins with: never before the first one. Few runs are
+// compared one by one, which is quicker; the end, where `canBeEnd` does not say otherwise, is not compared at all.
+std::string runOf(std::string_view figure, const std::vector<std::int64_t>& beginnings, std::string_view name,
+                  bool canBeEnd)
 {
     constexpr std::size_t few = 8;
     if (beginnings.size() > few)
         return fmt::format("arrayCount(x -> x <= {}, {})", figure, name);
-    std::string sum;
-    for (const std::int64_t beginning : beginnings)
-        sum += fmt::format("{}({} >= {})", sum.empty() ? "" : " + ", figure, beginning);
-    return fmt::format("({})", sum);
+    std::string sum = "(1";
+    for (std::size_t run = 1; run + (canBeEnd ? 0 : 1) < beginnings.size(); ++run)
+        sum += fmt::format(" + ({} >= {})", figure, beginnings[run]);
+    return sum + ')';
 }
 
 } // namespace
@@ -55,11 +56,11 @@ std::string DayTable::of(std::string_view moment, std::string_view name) const
 {
     return fmt::format("least(run_firsts[{0} AS {1}_run] + intDiv({2} - run_moments[{1}_run], toInt64({3})),"
                        " run_lasts[{1}_run]) AS {1}",
-                       runOf(moment, moments_, "run_moments"), name, moment, microsecondsADay);
+                       runOf(moment, moments_, "run_moments", false), name, moment, microsecondsADay);
 }
 
 std::string DayTable::beginning(std::string_view day) const
 {
-    const std::string run = runOf(day, firsts_, "run_firsts");
+    const std::string run = runOf(day, firsts_, "run_firsts", true);
     return fmt::format("(run_moments[{0}] + ({1} - run_firsts[{0}]) * {2})", run, day, microsecondsADay);
 }

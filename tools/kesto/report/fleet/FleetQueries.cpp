@@ -1,6 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
-// Names of columns within a query: u is the hash of the unit, s of its session, i of its row, k the key; n and r are
-// the numbers of session and row in the device's store. us is how long in microseconds, v the volume in millionths or
+// Names of columns within a query: u is the hash of the unit, s of its session, k the key; n and r are the numbers of
+// session and row in the device's store. us is how long in microseconds, v the volume in millionths or
 // -1, and f is 1 of a fault. Sums are of whole numbers.
 //
 // Tables may be distributed over servers. There, a subquery in a condition is GLOBAL: the first server asks it once for
@@ -9,6 +9,7 @@
 
 #include "foundation/values/Microseconds.h"
 #include "kesto/report/Report.h"
+#include "kesto/report/fleet/SqlText.h"
 
 #include <fmt/format.h>
 #include <fmt/ranges.h>
@@ -23,12 +24,20 @@ constexpr std::string_view sessionHash = "cityHash64(epoch, session)";
 // As of a piece of a stretch of the device's own report, in the same whole numbers.
 constexpr std::string_view volumeSum = "sum(intDiv(us, 1000000) * greatest(v, 0)"
                                        " + intDiv(us % 1000000 * greatest(v, 0) + 500000, 1000000))";
-const std::string figures = fmt::format("sum(us), sumIf(us, v = 0), sumIf(us, v < 0), {}", volumeSum);
+// Of rows, with names for the query around it.
+const std::string figures =
+    fmt::format("sum(us) AS played, sumIf(us, v = 0) AS muted, sumIf(us, v < 0) AS untold, {} AS volume", volumeSum);
+constexpr std::string_view sumsOfUnit =
+    "sum(played) AS played, sum(muted) AS muted, sum(untold) AS untold, sum(volume) AS volume, sum(faults) AS faults,"
+    " sum(sessions) AS sessions, sum(vanished) AS vanished, sum(counted) AS counted, sum(different) AS different,"
+    " sum(unwrapped) AS unwrapped";
+constexpr std::string_view sumsOfFigures = "sum(played), sum(muted), sum(untold), sum(volume), sum(faults)";
 // As Played::faultsAnHour works it out.
 constexpr std::string_view faultsAnHour = "faults * 3600 / (played / 1000000)";
 constexpr double microsecondsAnHour = 3'600'000'000;
 constexpr std::int64_t microsecondsADay = 86'400'000'000;
 constexpr std::uint64_t partsOfHashes = 1'000'003;
+constexpr std::string_view faultPrefix = "com.quarn.kesto.Error.";
 // Of rows that the database has several times, it keeps the last. What else differs makes the choice the same for all
 // queries if they came in one second.
 constexpr std::string_view lastOfEvent = "ORDER BY received DESC, cityHash64(application, audio_device, model, version,"
@@ -37,96 +46,7 @@ constexpr std::string_view lastOfStretch =
     "ORDER BY received DESC, cityHash64(application, audio_device, format, ifNull(toInt64(volume_millionths), -1),"
     " model, version, ending) LIMIT 1 BY device, epoch, id";
 
-// A character behind a backslash stands for itself.
-void appendLiteral(char character, std::string& expression)
-{
-    const bool isWord = (character >= '0' && character <= '9') || (character >= 'a' && character <= 'z')
-        || (character >= 'A' && character <= 'Z') || character == '_' || static_cast<unsigned char>(character) >= 0x80;
-    if (!isWord)
-        expression += '\\';
-    expression += character;
-}
-
-// The bytes of the character that begins there.
-std::string_view characterAt(std::string_view text, std::size_t place)
-{
-    std::size_t end = place + 1;
-    while (end < text.size() && (static_cast<unsigned char>(text[end]) & 0xc0) == 0x80)
-        ++end;
-    return text.substr(place, end - place);
-}
-
-void appendCharacter(std::string_view character, std::string& expression)
-{
-    for (const char byte : character)
-        appendLiteral(byte, expression);
-}
-
-// The set behind a "[" at that place, which moves behind its "]". Empty if it has no end: then nothing matches.
-std::string setAt(std::string_view glob, std::size_t& place)
-{
-    std::string set = "[";
-    const auto isAt = [&](char character) { return place < glob.size() && glob[place] == character; };
-    if (isAt('^')) {
-        set += '^';
-        ++place;
-    }
-    std::string_view before; // may begin a range
-    for (bool isFirst = true; place < glob.size(); isFirst = false) {
-        if (glob[place] == ']' && !isFirst) {
-            ++place;
-            return set + ']';
-        }
-        const bool isRange = glob[place] == '-' && !before.empty() && place + 1 < glob.size() && glob[place + 1] != ']';
-        place += isRange ? 1 : 0;
-        const std::string_view character = characterAt(glob, place);
-        place += character.size();
-        if (!isRange) {
-            appendCharacter(character, set);
-            before = character;
-            continue;
-        }
-        if (before <= character) { // bytes of UTF-8 are in the order of their characters
-            set += '-';
-            appendCharacter(character, set);
-        }
-        before = {};
-    }
-    return {};
-}
-
 } // namespace
-
-std::string sqlText(std::string_view text)
-{
-    std::string literal = "'";
-    for (const char character : text) {
-        if (character == '\'' || character == '\\')
-            literal += '\\';
-        literal += character;
-    }
-    return literal + '\'';
-}
-
-std::string regularExpression(std::string_view glob)
-{
-    std::string expression = "^";
-    for (std::size_t place = 0; place < glob.size();) {
-        const std::string_view character = characterAt(glob, place);
-        place += character.size();
-        if (character == "*")
-            expression += "(.|\\n)*";
-        else if (character == "?")
-            expression += "(.|\\n)";
-        else if (character != "[")
-            appendCharacter(character, expression);
-        else if (const std::string set = setAt(glob, place); !set.empty())
-            expression += set;
-        else
-            return "^$a"; // nothing
-    }
-    return expression + '$';
-}
 
 FleetQueries::FleetQueries(FleetQuestion question, const std::vector<std::int64_t>& days)
     : question_(std::move(question)),
@@ -183,42 +103,67 @@ std::string matching(std::string_view column, const std::string& glob)
 
 // --- Faults
 
+// A condition of events, in the span.
+std::string FleetQueries::isFault() const
+{
+    return fmt::format("name LIKE '{}%' AND happened_us >= {} AND happened_us < {}{}", faultPrefix, from_, until_,
+                       unitCondition());
+}
+
+std::string FleetQueries::anyFault() const
+{
+    return fmt::format("SELECT id FROM events WHERE {} LIMIT 1", isFault());
+}
+
 // Those of the applications that are asked for, and of sessions that did what is asked for. To know the device takes
 // longer; without it, faults of all devices come.
 std::string FleetQueries::faults(bool withDevices) const
 {
     const HistoryQuestion& asked = question_.history;
-    std::string each = fmt::format(
-        "SELECT {} AS u, {} AS st, {} AS s, device AS unit, epoch, session, happened_us AS happened,"
-        " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
-        " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM (SELECT device, epoch, id,"
-        " session, happened_us, name, application, audio_device, model, version, late_cycles FROM events"
-        " WHERE name LIKE 'com.quarn.kesto.Error.%' AND happened_us >= {} AND happened_us < {}"
-        " AND received < toDateTime({}){} {}) WHERE 1{}{}",
-        unitHash, storeHash, sessionHash, std::string_view("com.quarn.kesto.Error.").size() + 1, from_, until_,
-        present_, unitCondition(), lastOfEvent, matching("application", asked.applications), direction_);
+    std::string each =
+        fmt::format("SELECT {} AS u, {} AS st, {} AS s, id, device AS unit, epoch, session, happened_us AS happened,"
+                    " substring(name, {}) AS kind, application, audio_device AS named, model, version,"
+                    " toInt64(least(greatest(late_cycles, 0), 1000000000)) AS late FROM (SELECT device, epoch, id,"
+                    " session, happened_us, name, application, audio_device, model, version, late_cycles FROM events"
+                    " WHERE {} AND received < toDateTime({}) {}) WHERE 1{}{}",
+                    unitHash, storeHash, sessionHash, faultPrefix.size() + 1, isFault(), present_, lastOfEvent,
+                    matching("application", asked.applications), direction_);
     if (!withDevices)
         return each;
-    // A fault without a device is on that on which its session played then; in between, before it.
-    const std::string played = fmt::format(
-        "SELECT {} AS st, session, arraySort(groupArray((began_us, id, audio_device, format))) AS own FROM stretches"
-        " WHERE recording = {} AND {} AND ({}, session) GLOBAL IN ({}) GROUP BY st, session",
-        storeHash, asked.isRecording ? 1 : 0, touching(true), storeHash, sessionsWithFault(true));
     return fmt::format(
         "SELECT * FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late,"
-        " greatest(arrayCount(x -> x.1 <= happened, own), 1) + 0 * happened AS place," // a lambda's column is forgotten
-        " if(named = '' AND session != 0, arrayMap(x -> x.3, own)[place], named) AS device,"
-        " if(session != 0, arrayMap(x -> x.4, own)[place], '') AS format"
-        " FROM (SELECT u, s, unit, epoch, session, happened, kind, application, model, version, late, named, own"
-        " FROM ({}) ANY LEFT JOIN ({}) USING (st, session))) WHERE 1{}",
-        each, played, matching("device", asked.devices));
+        " if(named = '', played_on, named) AS device, played_as AS format FROM ({}) ANY LEFT JOIN ({}) USING (st, id)) "
+        "WHERE 1{}",
+        each, placesOfFaults(), matching("device", asked.devices));
+}
+
+// store, ID of a fault, device and format: a fault is where its session played then; in between, where it had played
+// before. Stretches and faults of each session are put in one order, and each fault gets the number of the stretch
+// before it. So a session costs as much as it has of both, and not of the one times the other.
+std::string FleetQueries::placesOfFaults() const
+{
+    const std::string both = fmt::format(
+        "SELECT {0} AS st, session, began_us AS moment, materialize(toUInt8(1)) AS played, id, audio_device AS "
+        "played_on,"
+        " format AS played_as FROM stretches WHERE recording = {1} AND {2} AND (st, session) GLOBAL IN ({3}) UNION ALL"
+        " SELECT {0} AS st, session, happened_us AS moment, materialize(toUInt8(0)) AS played, id,"
+        " materialize('') AS played_on, materialize('') AS played_as FROM events WHERE {4} AND session != 0{5}",
+        storeHash, question_.history.isRecording ? 1 : 0, touching(true), sessionsWithFault(true), isFault(),
+        direction_);
+    return fmt::format(
+        "SELECT st, id, played_on, played_as FROM (SELECT st, anyIf(row.4, row.2 = 0) AS played_on,"
+        " anyIf(row.5, row.2 = 0) AS played_as, groupArrayIf(row.3, row.2 = 1) AS ids FROM (SELECT st, session, row,"
+        " greatest(number, 1) AS place FROM (SELECT st, session,"
+        " arraySort(groupArray((moment, 1 - played, id, played_on, played_as))) AS rows,"
+        " arrayCumSum(arrayMap(x -> 1 - x.2, rows)) AS numbers FROM ({}) GROUP BY st, session)"
+        " ARRAY JOIN rows AS row, numbers AS number) GROUP BY st, session, place) ARRAY JOIN ids AS id",
+        both);
 }
 
 std::string FleetQueries::sessionsWithFault(bool withDirection) const
 {
-    return fmt::format("SELECT {} AS st, session FROM events WHERE name LIKE 'com.quarn.kesto.Error.%'"
-                       " AND happened_us >= {} AND happened_us < {}{}{}",
-                       storeHash, from_, until_, unitCondition(), withDirection ? direction_ : "");
+    return fmt::format("SELECT {} AS st, session FROM events WHERE {}{}", storeHash, isFault(),
+                       withDirection ? direction_ : "");
 }
 
 std::string FleetQueries::recordings() const
@@ -274,7 +219,7 @@ std::string FleetQueries::stretchRows(std::string_view table, std::string_view k
 {
     const HistoryQuestion& asked = question_.history;
     return fmt::format(
-        "SELECT {} AS u, {} AS s, cityHash64(epoch, id) AS i, session AS n, id AS r, toInt64(greatest(began_us, {})) AS"
+        "SELECT {} AS u, {} AS s, session AS n, id AS r, toInt64(greatest(began_us, {})) AS"
         " begins, least(began_us + microseconds, {}) AS ends, {}, ifNull(toInt64(volume_millionths), -1) AS v,"
         " toUInt8(ending = 'vanished' AND began_us + microseconds <= {}) AS gone, materialize(toUInt64(0)) AS f FROM {}"
         " WHERE recording = {} AND {}{}{}{}",
@@ -286,7 +231,7 @@ std::string FleetQueries::stretchRows(std::string_view table, std::string_view k
 // few units by their hashes. Which row of several stays does not depend on what is asked.
 std::string FleetQueries::onceEach(std::string_view key, const std::string& condition, std::string_view with) const
 {
-    constexpr std::string_view columns = "u, s, i, n, r, us, v, gone, f, k";
+    constexpr std::string_view columns = "u, s, n, r, us, v, gone, f, k";
     const auto rowsOf = [&](std::string_view table, const std::string& units) {
         return fmt::format("SELECT {} FROM ({}{})", columns, with, stretchRows(table, key, condition + units));
     };
@@ -308,7 +253,7 @@ namespace {
 // A fault as a row.
 std::string faultRow(std::string_view key, const std::string& faults)
 {
-    return fmt::format("SELECT u, s, materialize(toUInt64(0)) AS i, session AS n, materialize(toUInt64(0)) AS r,"
+    return fmt::format("SELECT u, s, session AS n, materialize(toUInt64(0)) AS r,"
                        " materialize(toInt64(0)) AS us, materialize(toInt64(-1)) AS v, materialize(toUInt8(0)) AS gone,"
                        " materialize(toUInt64(1)) AS f, {} AS k FROM ({})",
                        key, faults);
@@ -317,7 +262,7 @@ std::string faultRow(std::string_view key, const std::string& faults)
 // What `by` is called of a fault.
 std::string_view ofFault(std::string_view by)
 {
-    return by == "audio_device" ? "device" : by;
+    return by == "audio_device" ? "device" : by == "device" ? "unit" : by;
 }
 
 } // namespace
@@ -335,19 +280,22 @@ std::string FleetQueries::daysOfStretches(const std::string& key, const std::str
                        onceEach(parts, condition + " AND first != last", with));
 }
 
-std::string FleetQueries::rows(std::string_view by, bool isHashed) const
+// With the faults, if the span has any.
+std::string FleetQueries::withFaults(std::string rows, const std::string& with, std::string_view key,
+                                     std::string_view by, const std::string& condition) const
 {
-    const auto hashed = [isHashed](std::string_view key) {
-        return isHashed ? fmt::format("cityHash64({})", key) : std::string(key);
-    };
-    const std::string all = faults(needsDevices(by));
+    if (!hasFaults_)
+        return rows;
+    return fmt::format("{} UNION ALL {}{}{}", std::move(rows), with, faultRow(key, faults(needsDevices(by))),
+                       condition);
+}
+
+std::string FleetQueries::rows(std::string_view by) const
+{
     if (by == "day")
-        return fmt::format("{} UNION ALL {}{}", daysOfStretches(hashed("day"), ""), days_.with(),
-                           faultRow(hashed(fmt::format("({})", days_.of("happened", "day"))), all));
-    const bool isByStore = by.empty();
-    const std::string ofStretch = isByStore ? std::string(storeHash) : hashed(by);
-    return fmt::format("{} UNION ALL {}", onceEach(fmt::format("ends - begins AS us, {} AS k", ofStretch), ""),
-                       faultRow(isByStore ? "cityHash64(unit, epoch)" : hashed(ofFault(by)), all));
+        return withFaults(daysOfStretches("day", ""), days_.with(), fmt::format("({})", days_.of("happened", "day")),
+                          by, "");
+    return withFaults(onceEach(fmt::format("ends - begins AS us, {} AS k", by), ""), "", ofFault(by), by, "");
 }
 
 std::string FleetQueries::daysOf(std::string_view by, const std::vector<std::string>& hashes) const
@@ -359,10 +307,9 @@ std::string FleetQueries::daysOf(std::string_view by, const std::vector<std::str
         return fmt::format("cityHash64({}) IN ({})", key, fmt::join(hashes, ","));
     };
     const std::string ofStretches = daysOfStretches(dayAndHash("day", by), " AND " + isAmong(by));
-    const std::string ofFaults =
-        faultRow(dayAndHash(days_.of("happened", "day"), ofFault(by)), faults(needsDevices(by)));
-    return fmt::format("SELECT k, '', {}, sum(f) FROM ({} UNION ALL {}{} WHERE {}) GROUP BY k", figures, ofStretches,
-                       days_.with(), ofFaults, isAmong(ofFault(by)));
+    return fmt::format("SELECT k, {}, sum(f) FROM ({}) GROUP BY k", figures,
+                       withFaults(ofStretches, days_.with(), dayAndHash(days_.of("happened", "day"), ofFault(by)), by,
+                                  " WHERE " + isAmong(ofFault(by))));
 }
 
 // --- Queries
@@ -373,6 +320,12 @@ std::string distribution(std::string_view figure, std::string_view condition)
 {
     return fmt::format("quantileExactIf(0.5)({0}, {1}), quantileExactIf(0.9)({0}, {1}), maxIf({0}, {1})", figure,
                        condition);
+}
+
+// The first lines by two figures, then by name; 0: all in any order.
+std::string largest(std::string_view figure, std::string_view second, std::size_t most)
+{
+    return most == 0 ? std::string() : fmt::format(" ORDER BY {} DESC, {} DESC, name LIMIT {}", figure, second, most);
 }
 
 std::string isAboveFloor()
@@ -386,20 +339,26 @@ std::string isAboveFloor()
 // there twice: what only seems so is chosen once, too.
 std::string FleetQueries::all() const
 {
+    std::string parts =
+        fmt::format("SELECT any(u) AS unit, {}, materialize(toUInt64(0)) AS faults, uniqExact(n) AS sessions,"
+                    " uniqExactIf(n, gone) AS vanished, count() AS counted, uniqExact(toUInt32(r)) AS different,"
+                    " sum(toFloat64(us)) AS unwrapped FROM ({})"
+                    " GROUP BY k",
+                    figures, onceEach(fmt::format("ends - begins AS us, {} AS k", storeHash), ""));
+    if (hasFaults_)
+        parts += fmt::format(" UNION ALL SELECT u AS unit, {0} AS played, {0} AS muted, {0} AS untold, {0} AS volume,"
+                             " count() AS faults, {1} AS sessions, {1} AS vanished, {1} AS counted, {1} AS different,"
+                             " materialize(toFloat64(0)) AS unwrapped"
+                             " FROM ({2}) GROUP BY unit",
+                             "materialize(toInt64(0))", "materialize(toUInt64(0))", faults(needsDevices("")));
     const std::string floor = isAboveFloor();
     return fmt::format(
-        "SELECT sum(played), sum(muted), sum(untold), sum(volume), sum(faults), sum(sessions), sum(vanished),"
-        " countIf(sessions > 0), {}, countIf({}), {}, groupArrayIf({})(toString(u), counted != different),"
-        " arrayMap(x -> toString(x.2), arraySlice(arrayReverseSort(groupArrayIf(({}, u), faults > 0 AND {})), 1, 10))"
-        " FROM (SELECT u1 AS u, sum(played1) AS played, sum(muted1) AS muted, sum(untold1) AS untold,"
-        " sum(volume1) AS volume, sum(faults1) AS faults, sum(sessions1) AS sessions, sum(vanished1) AS vanished,"
-        " sum(rows1) AS counted, sum(different1) AS different FROM (SELECT any(u) AS u1, sum(us) AS played1,"
-        " sumIf(us, v = 0) AS muted1, sumIf(us, v < 0) AS untold1,"
-        " {} AS volume1, sum(f) AS faults1,"
-        " uniqExactIf(n, f = 0) AS sessions1, uniqExactIf(n, gone) AS vanished1, countIf(f = 0) AS rows1,"
-        " uniqExactIf(toUInt32(r), f = 0) AS different1 FROM ({}) GROUP BY k) GROUP BY u)",
-        distribution("played", "sessions > 0"), floor, distribution(faultsAnHour, floor), mostUnits + 1, faultsAnHour,
-        floor, volumeSum, rows("", false));
+        "SELECT {0}, sum(sessions), sum(vanished), countIf(played > 0), {1}, countIf({2}), {3}, sum(unwrapped),"
+        " groupArrayIf({4})(toString(unit), counted != different), arrayMap(x -> toString(x.2),"
+        " arraySlice(arrayReverseSort(groupArrayIf(({5}, unit), faults > 0 AND {2})), 1, 10))"
+        " FROM (SELECT unit, {6} FROM ({7}) GROUP BY unit)",
+        sumsOfFigures, distribution("played", "played > 0"), floor, distribution(faultsAnHour, floor), mostUnits + 1,
+        faultsAnHour, sumsOfUnit, parts);
 }
 
 std::string FleetQueries::doubled() const
@@ -410,18 +369,28 @@ std::string FleetQueries::doubled() const
                        unitHash, storeHash, question_.history.isRecording ? 1 : 0, touching(false), mostUnits + 1);
 }
 
-std::string FleetQueries::sums(std::string_view by) const
+// By unit and key first, if figures over units are asked for, else by the key: by one number, the quickest to group by.
+std::string FleetQueries::linesByUnit(std::string_view by, const LineFigures& asked) const
 {
-    return fmt::format("SELECT k, toString(cityHash64(k)), {}, sum(f) FROM ({}) GROUP BY k", figures, rows(by, false));
+    return fmt::format("SELECT any(k) AS name, {}, sum(f) AS faults{} FROM ({}) GROUP BY cityHash64({}k)", figures,
+                       asked.withSessions ? ", uniqExactIf(s, f = 0) AS sessions" : "", rows(by),
+                       asked.withOverUnits || asked.withSessions ? "u, " : "");
 }
 
-std::string FleetQueries::overUnits(std::string_view by) const
+std::string FleetQueries::lines(std::string_view by, const LineFigures& asked, std::size_t most) const
 {
     const std::string floor = isAboveFloor();
-    return fmt::format("SELECT toString(k), sum(sessions), countIf(sessions > 0), countIf({0}), {1} FROM (SELECT u, k,"
-                       " sum(us) AS played, uniqExactIf(s, f = 0) AS sessions, sum(f) AS faults FROM ({2})"
-                       " GROUP BY u, k) GROUP BY k",
-                       floor, distribution(faultsAnHour, floor), rows(by, true));
+    const std::string overUnits = asked.withOverUnits
+        ? fmt::format(", countIf(played > 0), countIf({}), {}", floor, distribution(faultsAnHour, floor))
+        : std::string();
+    return fmt::format("SELECT name, toString(cityHash64(name)), {}{}{} FROM ({}) GROUP BY name{}", sumsOfFigures,
+                       asked.withSessions ? ", sum(sessions)" : "", overUnits, linesByUnit(by, asked),
+                       largest("sum(played)", "sum(faults)", most));
+}
+
+std::string FleetQueries::sumOfLines(std::string_view by) const
+{
+    return fmt::format("SELECT uniqExact(name), {} FROM ({})", sumsOfFigures, linesByUnit(by, {}));
 }
 
 std::string FleetQueries::volumes() const
@@ -430,9 +399,15 @@ std::string FleetQueries::volumes() const
                        onceEach("ends - begins AS us, toUInt64(0) AS k", ""));
 }
 
-std::string FleetQueries::faultKinds() const
+std::string FleetQueries::faultKinds(std::size_t most) const
 {
-    return fmt::format("SELECT kind, count(), uniqExact(u, s) FROM ({}) GROUP BY kind", faults(needsDevices("")));
+    return fmt::format("SELECT kind AS name, count(), uniqExact(u, s) FROM ({}) GROUP BY name{}",
+                       faults(needsDevices("")), largest("count()", "0", most));
+}
+
+std::string FleetQueries::sumOfFaultKinds() const
+{
+    return fmt::format("SELECT uniqExact(kind), count() FROM ({})", faults(needsDevices("")));
 }
 
 std::string FleetQueries::sessionsWithFaults() const
@@ -449,16 +424,18 @@ std::string FleetQueries::sessionsThatPlayedWithFaults() const
 
 std::string FleetQueries::units(const std::vector<std::string>& hashes) const
 {
-    const std::string chosen = hashes.empty() ? "" : fmt::format(" AND {} IN ({})", unitHash, fmt::join(hashes, ","));
-    const std::string ofFaults = fmt::format(
-        "SELECT unit AS name, s, materialize(toInt64(0)) AS us, materialize(toInt64(-1)) AS v,"
-        " materialize(toUInt64(1)) AS f, model AS m, version AS r, happened AS moment FROM ({}) WHERE 1{}",
-        faults(needsDevices("")), hashes.empty() ? "" : fmt::format(" AND u IN ({})", fmt::join(hashes, ",")));
-    const std::string ofStretches = onceEach("ends - begins AS us, (device, model, version, begins) AS k", chosen);
-    return fmt::format(
-        "SELECT name, argMax(m, moment), argMax(r, moment), {}, sum(f), uniqExactIf(s, f = 0) FROM (SELECT k.1 AS name,"
-        " s, us, v, f, k.2 AS m, k.3 AS r, k.4 AS moment FROM ({}) UNION ALL {}) GROUP BY name",
-        figures, ofStretches, ofFaults);
+    const std::string list = fmt::format("{}", fmt::join(hashes, ","));
+    const std::string ofFaults =
+        fmt::format("SELECT unit AS name, s, materialize(toInt64(0)) AS us, materialize(toInt64(-1)) AS v,"
+                    " materialize(toUInt64(1)) AS f, model AS m, version AS r, happened AS moment FROM ({})"
+                    " WHERE u IN ({})",
+                    faults(needsDevices("")), list);
+    const std::string ofStretches = onceEach("ends - begins AS us, (device, model, version, begins) AS k",
+                                             fmt::format(" AND {} IN ({})", unitHash, list));
+    return fmt::format("SELECT name, argMax(m, moment), argMax(r, moment), {}, sum(f), uniqExactIf(s, f = 0)"
+                       " FROM (SELECT k.1 AS name, s, us, v, f, k.2 AS m, k.3 AS r, k.4 AS moment FROM ({})"
+                       " UNION ALL {}) GROUP BY name",
+                       figures, ofStretches, ofFaults);
 }
 
 std::string FleetQueries::worstSessions() const

@@ -23,6 +23,12 @@ struct FleetSession {
     std::string session;
 };
 
+// What of each line costs more to find.
+struct LineFigures {
+    bool withSessions = false;
+    bool withOverUnits = false;
+};
+
 // What the columns of a query are called in the order in which they come stands at each function.
 class FleetQueries {
 public:
@@ -36,6 +42,9 @@ public:
     // The present of the database. Later rows do not count, so that all queries of a report see the same.
     [[nodiscard]] static std::string present();
     void setPresent(std::string_view present) { present_ = present; }
+    // A row if the span has any fault. Without one, the other queries ask for none.
+    [[nodiscard]] std::string anyFault() const;
+    void setHasFaults(bool hasFaults) { hasFaults_ = hasFaults; }
     // store, session: of the sessions with faults that recorded. A fault does not say whether something was played or
     // recorded; its session does, by its stretches in the span and a day before it.
     [[nodiscard]] std::string recordings() const;
@@ -49,25 +58,29 @@ public:
     void setDoubled(const std::vector<std::string>& units);
 
     // microseconds, muted, without volume, volume, faults, sessions, vanished, units; median, 90 % and most of the
-    // microseconds of a unit; units above the floor; median, 90 % and worst of their faults an hour; units with doubled
-    // rows; those with most faults an hour.
+    // microseconds of a unit; units above the floor; median, 90 % and worst of their faults an hour; microseconds as a
+    // number that does not wrap; units with doubled rows; those with most faults an hour.
     [[nodiscard]] std::string all() const;
-    // key, hash of the key, microseconds, muted, without volume, volume, faults. `by` is a column, or "day".
-    [[nodiscard]] std::string sums(std::string_view by) const;
-    // day and hash of the key with a blank between, nothing, microseconds, muted, without volume, volume, faults: of
-    // the keys with those hashes.
+    // key, hash of the key, microseconds, muted, without volume, volume, faults; with sessions these; over units how
+    // many, how many above the floor, and median, 90 % and worst of the faults an hour of these. `by` is a column, or
+    // "day". The `most` with the most time, or all if that is 0.
+    [[nodiscard]] std::string lines(std::string_view by, const LineFigures& asked, std::size_t most) const;
+    // lines, and the sums of all of them.
+    [[nodiscard]] std::string sumOfLines(std::string_view by) const;
+    // day and hash of the key with a blank between, microseconds, muted, without volume, volume, faults: of the keys
+    // with those hashes.
     [[nodiscard]] std::string daysOf(std::string_view by, const std::vector<std::string>& hashes) const;
-    // hash of the key, sessions, units; median, 90 % and worst of the faults an hour of those above the floor.
-    [[nodiscard]] std::string overUnits(std::string_view by) const;
     // step, microseconds
     [[nodiscard]] std::string volumes() const;
-    // kind, faults, sessions
-    [[nodiscard]] std::string faultKinds() const;
+    // kind, faults, sessions: the `most` with the most faults, or all if that is 0.
+    [[nodiscard]] std::string faultKinds(std::size_t most) const;
+    // kinds, and the faults of all of them.
+    [[nodiscard]] std::string sumOfFaultKinds() const;
     // sessions
     [[nodiscard]] std::string sessionsWithFaults() const;
     [[nodiscard]] std::string sessionsThatPlayedWithFaults() const;
-    // unit, its last model and version in the span, microseconds, muted, without volume, volume, faults, sessions. Of
-    // those hashes, or of all if there are none.
+    // unit, its last model and version in the span, microseconds, muted, without volume, volume, faults, sessions: of
+    // those hashes.
     [[nodiscard]] std::string units(const std::vector<std::string>& hashes) const;
     // unit, epoch, session, late cycles, faults
     [[nodiscard]] std::string worstSessions() const;
@@ -86,8 +99,13 @@ private:
                                           const std::string& condition) const;
     [[nodiscard]] std::string onceEach(std::string_view key, const std::string& condition,
                                        std::string_view with = {}) const;
+    [[nodiscard]] std::string isFault() const;
     [[nodiscard]] std::string faults(bool withDevices) const;
-    [[nodiscard]] std::string rows(std::string_view by, bool isHashed) const;
+    [[nodiscard]] std::string placesOfFaults() const;
+    [[nodiscard]] std::string withFaults(std::string rows, const std::string& with, std::string_view key,
+                                         std::string_view by, const std::string& condition) const;
+    [[nodiscard]] std::string rows(std::string_view by) const;
+    [[nodiscard]] std::string linesByUnit(std::string_view by, const LineFigures& asked) const;
     [[nodiscard]] std::string daysOfStretches(const std::string& key, const std::string& condition) const;
     [[nodiscard]] std::string touching(bool isWide) const;
     [[nodiscard]] std::string unitCondition() const;
@@ -99,12 +117,8 @@ private:
     std::int64_t from_;
     std::int64_t until_;
     std::string present_ = "now() + 1";
+    bool hasFaults_ = true;
     std::string direction_; // a condition of a fault
     std::string doubled_; // a list of parts of the hashes of units; empty: none
     bool areManyDoubled_ = false;
 };
-
-// A text as a literal of SQL.
-[[nodiscard]] std::string sqlText(std::string_view text);
-// A GLOB of SQLite as a regular expression of the database.
-[[nodiscard]] std::string regularExpression(std::string_view glob);

@@ -13,6 +13,7 @@
 #include <charconv>
 #include <cmath>
 #include <fmt/format.h>
+#include <limits>
 #include <map>
 #include <stdexcept>
 #include <tuple>
@@ -192,25 +193,33 @@ std::vector<std::int64_t> boundaries(const std::vector<ReportDay>& days, const T
 struct SummedLine {
     std::string key;
     PlayedSum sum;
-    std::optional<OverUnits> overUnits;
+    std::optional<OverUnits> overUnits = {};
+    std::size_t others = 0;
 };
 
 std::vector<ReportLine> sorted(std::vector<SummedLine> lines)
 {
     std::ranges::sort(lines, [](const SummedLine& one, const SummedLine& other) {
-        return std::tie(other.sum.microseconds, other.sum.faults, one.key)
-            < std::tie(one.sum.microseconds, one.sum.faults, other.key);
+        return std::tie(one.others, other.sum.microseconds, other.sum.faults, one.key)
+            < std::tie(other.others, one.sum.microseconds, one.sum.faults, other.key);
     });
     std::vector<ReportLine> finished;
     finished.reserve(lines.size());
     for (SummedLine& line : lines)
-        finished.push_back({.key = std::move(line.key), .played = line.sum.played(), .overUnits = line.overUnits});
+        finished.push_back({.key = std::move(line.key),
+                            .played = line.sum.played(),
+                            .overUnits = line.overUnits,
+                            .others = line.others});
     return finished;
 }
 
 std::string_view columnOf(ReportBy by)
 {
-    return by == ReportBy::Device ? "audio_device" : name(by);
+    switch (by) {
+    case ReportBy::Device: return "audio_device";
+    case ReportBy::Unit: return "device";
+    default: return name(by);
+    }
 }
 
 class FleetReportMaker {
@@ -231,10 +240,10 @@ public:
     {
         database_.ask(FleetQueries::present(),
                       [this](Cells& row) { queries_.setPresent(std::to_string(row.integer())); });
-        std::vector<FleetSession> recordings = readSessions(queries_.recordings());
-        if (!recordings.empty() && !report_.isRecording)
-            recordings = readSessions(queries_.onlyRecordings(recordings));
-        queries_.setRecordings(recordings);
+        database_.ask(queries_.anyFault(), [this](Cells&) { hasFaults_ = true; });
+        queries_.setHasFaults(hasFaults_);
+        if (hasFaults_)
+            readRecordings();
         const HistoryQuestion& asked = question_.history;
         const bool isOfAllRows = asked.applications == "*" && asked.devices == "*";
         const std::vector<std::string> doubled = isOfAllRows ? readAll() : readDoubled();
@@ -245,10 +254,8 @@ public:
             readTable(by);
         if (parts_.withDaysOfLines)
             readDaysOfLines();
-        if (parts_.withWorst) {
-            readWorstUnits();
-            readWorstSessions();
-        }
+        if (parts_.withWorst)
+            readWorst();
         return std::move(report_);
     }
 
@@ -263,6 +270,14 @@ private:
             sessions.push_back({std::move(store), row.text()});
         });
         return sessions;
+    }
+
+    void readRecordings()
+    {
+        std::vector<FleetSession> recordings = readSessions(queries_.recordings());
+        if (!recordings.empty() && !report_.isRecording)
+            recordings = readSessions(queries_.onlyRecordings(recordings));
+        queries_.setRecordings(recordings);
     }
 
     std::vector<std::string> readDoubled()
@@ -289,6 +304,9 @@ private:
                     *each = *each / foundation::millionthsOfOne / secondsAnHour;
             units.compared = row.count();
             units.faultsAnHour = row.distribution(units.compared != 0);
+            if (row.real().value_or(0) >= static_cast<double>(std::numeric_limits<std::int64_t>::max()))
+                throw std::runtime_error("the stretches of the span have more than 292,000 years together, which no "
+                                         "device plays: ask for a shorter span, or for one unit by --unit");
             doubled = row.texts();
             worstUnits_ = row.texts();
         });
@@ -300,8 +318,11 @@ private:
         switch (by) {
         case ReportBy::Day: readDays(); break;
         case ReportBy::Volume: readVolumes(); break;
-        case ReportBy::Fault: readFaultKinds(); break;
-        case ReportBy::Unit: fleet().units = sorted(readUnits({})); break;
+        case ReportBy::Fault:
+            if (hasFaults_)
+                readFaultKinds();
+            break;
+        case ReportBy::Unit: fleet().units = sorted(readLines(by)); break;
         case ReportBy::Application: report_.applications = sorted(readLines(by)); break;
         case ReportBy::Device: report_.devices = sorted(readLines(by)); break;
         case ReportBy::Format: report_.formats = sorted(readLines(by)); break;
@@ -312,30 +333,49 @@ private:
 
     std::vector<SummedLine> readLines(ReportBy by)
     {
+        const std::size_t most = by == ReportBy::Day ? 0 : parts_.mostLines;
+        const LineFigures asked{
+            .withSessions = parts_.withSessions,
+            .withOverUnits = parts_.withOverUnits && by != ReportBy::Day && by != ReportBy::Unit,
+        };
         std::vector<SummedLine> lines;
-        std::unordered_map<std::string, std::size_t> places; // by hash
-        database_.ask(queries_.sums(columnOf(by)), [&](Cells& row) {
-            std::string key = row.text();
-            const std::string hash = row.text();
+        database_.ask(queries_.lines(columnOf(by), asked, most), [&](Cells& row) {
+            SummedLine& line = lines.emplace_back(row.text());
+            std::string hash = row.text();
             if (parts_.withDaysOfLines)
-                hashes_[key] = hash;
-            places[hash] = lines.size();
-            lines.push_back({.key = std::move(key), .sum = row.sum(), .overUnits = {}});
-        });
-        if (!parts_.withOverUnits)
-            return lines;
-        database_.ask(queries_.overUnits(columnOf(by)), [&](Cells& row) {
-            const auto place = places.find(row.text());
-            if (place == places.end()) // came in between
+                hashes_[line.key] = std::move(hash);
+            line.sum = row.sum();
+            if (asked.withSessions)
+                line.sum.sessions = row.count();
+            if (!asked.withOverUnits)
                 return;
-            SummedLine& line = lines[place->second];
-            line.sum.sessions = row.count();
             OverUnits& units = line.overUnits.emplace();
             units.units = row.count();
             units.compared = row.count();
             units.faultsAnHour = row.distribution(units.compared != 0);
         });
+        if (most != 0 && lines.size() == most)
+            addOthers(by, lines);
         return lines;
+    }
+
+    // One line for all that were not asked for.
+    void addOthers(ReportBy by, std::vector<SummedLine>& lines)
+    {
+        SummedLine others;
+        database_.ask(queries_.sumOfLines(columnOf(by)), [&](Cells& row) {
+            others.others = row.count() - lines.size();
+            others.sum = row.sum();
+        });
+        for (const SummedLine& line : lines) {
+            others.sum.microseconds -= line.sum.microseconds;
+            others.sum.muted -= line.sum.muted;
+            others.sum.noVolume -= line.sum.noVolume;
+            others.sum.volume -= line.sum.volume;
+            others.sum.faults -= line.sum.faults;
+        }
+        if (others.others != 0)
+            lines.push_back(std::move(others));
     }
 
     // Their keys are numbers of days.
@@ -363,7 +403,6 @@ private:
             return;
         database_.ask(queries_.daysOf(columnOf(by), hashes), [&](Cells& row) {
             const std::string key = row.text(); // the number of the day, a blank, and the hash of the line's key
-            static_cast<void>(row.text());
             const std::size_t blank = key.find(' ');
             const auto day = static_cast<std::size_t>(std::stoull("0" + key.substr(0, blank)));
             const auto rank = blank == std::string::npos ? ranks.end() : ranks.find(key.substr(blank + 1));
@@ -395,7 +434,7 @@ private:
 
     void readFaultKinds()
     {
-        database_.ask(queries_.faultKinds(), [this](Cells& row) {
+        database_.ask(queries_.faultKinds(parts_.mostLines), [this](Cells& row) {
             ReportLine line{.key = row.text(), .played = {}};
             line.played.faults = row.count();
             line.played.sessions = row.count();
@@ -404,6 +443,17 @@ private:
         std::ranges::sort(report_.faultKinds, [](const ReportLine& one, const ReportLine& other) {
             return std::tie(other.played.faults, one.key) < std::tie(one.played.faults, other.key);
         });
+        if (parts_.mostLines == 0 || report_.faultKinds.size() != parts_.mostLines)
+            return;
+        ReportLine others;
+        database_.ask(queries_.sumOfFaultKinds(), [&](Cells& row) {
+            others.others = row.count() - report_.faultKinds.size();
+            others.played.faults = row.count();
+        });
+        for (const ReportLine& line : report_.faultKinds)
+            others.played.faults -= line.played.faults;
+        if (others.others != 0)
+            report_.faultKinds.push_back(std::move(others));
     }
 
     std::vector<SummedLine> readUnits(const std::vector<std::string>& hashes)
@@ -418,6 +468,15 @@ private:
             lines.push_back(std::move(line));
         });
         return lines;
+    }
+
+    void readWorst()
+    {
+        report_.faultless = report_.all.sessions;
+        if (!hasFaults_)
+            return;
+        readWorstUnits();
+        readWorstSessions();
     }
 
     void readWorstUnits()
@@ -449,7 +508,7 @@ private:
     {
         database_.ask(queries_.sessionsWithFaults(), [this](Cells& row) { report_.withFaults = row.count(); });
         database_.ask(queries_.sessionsThatPlayedWithFaults(),
-                      [this](Cells& row) { report_.faultless = report_.all.sessions - row.count(); });
+                      [this](Cells& row) { report_.faultless -= row.count(); });
         std::vector<SessionName> names; // the worst first
         database_.ask(queries_.worstSessions(), [&](Cells& row) { names.push_back(sessionIn(row)); });
         if (names.empty())
@@ -506,6 +565,7 @@ private:
     Report report_;
     FleetDatabase database_;
     FleetQueries queries_;
+    bool hasFaults_ = false;
     std::map<std::string, std::string> hashes_; // by the key of a line
     std::vector<std::string> worstUnits_; // hashes
     std::map<std::string, std::pair<std::string, std::string>> labels_; // model and version by unit

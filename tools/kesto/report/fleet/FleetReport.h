@@ -9,6 +9,7 @@
 #include "kesto/history/History.h"
 #include "kesto/report/ReportTable.h"
 
+#include <cstddef>
 #include <filesystem>
 #include <string>
 #include <vector>
@@ -26,7 +27,9 @@ struct FleetQuestion {
 // What takes time to find, so that only what is shown is asked.
 struct FleetParts {
     std::vector<ReportBy> tables = {};
-    bool withOverUnits = false; // sessions, and how faults are distributed, of each line
+    std::size_t mostLines = 0; // of a table, and one for all others; 0: all
+    bool withSessions = false; // of each line
+    bool withOverUnits = false; // how faults are distributed, of each line
     bool withWorst = false; // units and sessions
     bool withDaysOfLines = false; // what each day has by application and by device
 };

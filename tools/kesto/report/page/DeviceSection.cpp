@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Which device had which share of the time.
+#include "kesto/report/ReportTable.h"
 #include "kesto/report/ReportWords.h"
 #include "kesto/report/page/PageColumns.h"
 #include "kesto/report/page/PageSections.h"
@@ -67,7 +68,7 @@ std::string tableOf(const std::vector<ReportLine>& lines, std::size_t named, dou
     for (std::size_t index = 0; index < named; ++index)
         table.rows.push_back(rowOf("<bdi>" + htmlDevices(lines[index].key) + "</bdi>", lines[index].played, whole));
     if (lines.size() > named)
-        table.rows.push_back(rowOf(othersText(lines.size(), named), othersOf(lines, named).played, whole));
+        table.rows.push_back(rowOf(othersText(numberOf(lines), named), othersOf(lines, named).played, whole));
     return tableHTML(table);
 }
 
@@ -82,7 +83,7 @@ std::string deviceSection(const Report& report, const PageWords& words)
     for (std::size_t index = 0; index < named; ++index)
         html += shareRow(htmlDevices(report.devices[index].key, longestLabel), report.devices[index].played, whole);
     if (report.devices.size() > named)
-        html += shareRow(othersText(report.devices.size(), named), othersOf(report.devices, named).played, whole);
+        html += shareRow(othersText(numberOf(report.devices), named), othersOf(report.devices, named).played, whole);
     html += "</ul>" + tableOf(report.devices, named, whole, "Devices as a table", "Device");
     const auto tableOfNamed = [&](const std::vector<ReportLine>& lines, const char* summary, const char* heading) {
         return lines.empty() ? std::string()

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Faults by device and day. Their colour is their number for each hour of playing: a busy day is no bad day.
+#include "kesto/report/ReportTable.h"
 #include "kesto/report/page/PageColumns.h"
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"
@@ -80,7 +81,7 @@ std::string heatTable(const Report& report, const PageColumns& columns, const Pa
     for (std::size_t index = 0; index < named; ++index)
         html += row(htmlDevices(report.devices[index].key, roomForName), index, columns, words);
     if (report.devices.size() > named)
-        html += row(othersText(report.devices.size(), named), named, columns, words);
+        html += row(othersText(numberOf(report.devices), named), named, columns, words);
     return html + "</table></div>";
 }
 
@@ -111,7 +112,7 @@ std::string kindsOf(const Report& report)
         html +=
             fmt::format("{}<bdi>{}</bdi> {}", index == 0 ? "" : ", ",
                         htmlName(report.faultKinds[index].key, longestLabel), report.faultKinds[index].played.faults);
-    return html + (report.faultKinds.size() > named ? ", " + othersText(report.faultKinds.size(), named) : "");
+    return html + (report.faultKinds.size() > named ? ", " + othersText(numberOf(report.faultKinds), named) : "");
 }
 
 } // namespace

@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // How the units of a fleet differ: by model, by release, and those that went worst.
+#include "kesto/report/ReportTable.h"
 #include "kesto/report/ReportWords.h"
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"
@@ -44,7 +45,7 @@ std::string tableOf(std::string_view name, const std::vector<ReportLine>& lines,
     }
     html += "</table></div>";
     if (lines.size() > mostLines)
-        html += fmt::format("<p class=note>and {} more", lines.size() - mostLines);
+        html += fmt::format("<p class=note>and {} more", numberOf(lines) - mostLines);
     return html;
 }
 

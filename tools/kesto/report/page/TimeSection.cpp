@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // How long was played a day: stacked bars, the application with the most time at the bottom.
+#include "kesto/report/ReportTable.h"
 #include "kesto/report/page/PageColumns.h"
 #include "kesto/report/page/PageSections.h"
 #include "kesto/report/page/PageText.h"
@@ -40,7 +41,7 @@ public:
     [[nodiscard]] std::string name(std::size_t index, std::size_t mostCharacters) const
     {
         return index < named_ ? htmlName(report_.applications[index].key, mostCharacters)
-                              : othersText(report_.applications.size(), named_);
+                              : othersText(numberOf(report_.applications), named_);
     }
     [[nodiscard]] double seconds(std::size_t index) const
     {

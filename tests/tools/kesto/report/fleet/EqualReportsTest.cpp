@@ -26,6 +26,11 @@ const std::string unitB = "fedcba9876543210fedcba9876543210";
 // What a fleet cannot know.
 const std::set<std::string, std::less<>> ofDeviceOnly{"running", "overlapping", "process_id", "user"};
 
+// What a device's own report does not have.
+const std::set<std::string, std::less<>> ofFleetOnly{
+    "units",  "units_compared", "hours_of_units", "faults_an_hour_of_units",
+    "models", "versions",       "worst_units",    "unit"};
+
 // What of the device's report the fleet's does not have, or has otherwise; a line each. Numbers are compared as text.
 std::string differences(const std::string& place, const Value& own, const Value& ofFleet)
 {
@@ -40,6 +45,9 @@ std::string differences(const std::string& place, const Value& own, const Value&
                 text += found == nullptr ? fmt::format("{}: the fleet lacks {}\n", place, key.view())
                                          : differences(place + "/" + std::string(key.view()), value, *found);
         }
+        for (const auto& [key, value] : other)
+            if (!ofFleetOnly.contains(key.view()) && dictionary->find(key.view()) == nullptr)
+                text += fmt::format("{}: only the fleet has {}\n", place, key.view());
         return text;
     }
     if (const auto array = own.array()) {
@@ -103,6 +111,10 @@ TEST_P(EqualReports, AreEqualToTheLastDigit)
         expectEqual(store, unit, whole);
         expectEqual(store, unit, with(whole, {"--recording"}));
     }
+    for (const char* const figure : {"sessions", "faults", "vanished"}) {
+        const auto of = [&](const Tool::Arguments& more) { return json(with(whole, more)).find(figure)->asDouble(); };
+        EXPECT_EQ(of({}), of({"--unit", unitA}) + of({"--unit", unitB})) << figure;
+    }
     expectEqual(storeA, unitA, {"--since", at(3, 4711), "--until", at(9, 1234)});
     expectEqual(storeB, unitB, with(whole, {"--day-starts", "04:30"}));
     expectEqual(storeB, unitB, with(whole, {"--utc"}));
@@ -111,7 +123,7 @@ TEST_P(EqualReports, AreEqualToTheLastDigit)
     expectEqual(storeA, unitA, with(whole, {"--application", "*.M?sic"}));
 }
 
-INSTANTIATE_TEST_SUITE_P(Zones, EqualReports, testing::Values(0U, 2U));
+INSTANTIATE_TEST_SUITE_P(Zones, EqualReports, testing::Values(0U, 1U, 2U));
 
 } // namespace
 } // namespace kesto_tool

@@ -3,10 +3,12 @@
 // with rows that come twice, with names that are made to harm, and with a database that it cannot ask.
 #include "kesto-ingest/MetricsServer.h"
 #include "kesto/report/fleet/FleetQueries.h"
+#include "kesto/report/fleet/SqlText.h"
 #include "kesto/store/EventDatabase.h"
 #include "support/KeptPort.h"
 #include "tools/kesto/report/fleet/Fleet.h"
 
+#include <algorithm>
 #include <chrono>
 #include <fmt/format.h>
 #include <fmt/ranges.h>
@@ -421,6 +423,71 @@ TEST_F(FleetReports, DrawApplicationsWithLongNames)
         lines += stretch(index, index, index, 1, fmt::format("\"{}{}\"", index, std::string(16'000, 'x')));
     insertLines(unit1, lines);
     EXPECT_THAT(print(inThatWeek({"--html", "-"})), HasSubstr("<h1>Audio report of a fleet</h1>"));
+}
+
+// One session with 3,000 stretches and 60,000 faults, 20 in each stretch: in memory of which their product needs more.
+TEST_F(FleetReports, FindTheDevicesOfManyFaultsOfOneSession)
+{
+    const auto insertRows = [this](std::string_view columns, std::string_view values, int count) {
+        EXPECT_EQ(server.select(fmt::format("INSERT INTO {0} SELECT toFixedString('{1}', 32) AS unit, unit, {2} FROM"
+                                            " (SELECT toInt64({3}) AS monday, toInt64(number) AS n FROM numbers({4}))",
+                                            columns, unit1, values, static_cast<std::int64_t>(monday * 1e6), count)),
+                  "");
+    };
+    insertRows("stretches (device, epoch, id, began_us, microseconds, session, audio_device, format)",
+               "n, monday + n * 20000000, 19000000, 1, if(n % 3 = 0, 'left', 'right'), if(n % 3 = 0, 'S16', 'F32')",
+               3000);
+    insertRows("events (device, epoch, id, happened_us, name, session)",
+               "n + 3000, monday + n * 1000000, 'com.quarn.kesto.Error.Overload', 1", 60'000);
+    constexpr double week = 604'800;
+    FleetQueries queries({.history = {.span = {.from = monday, .until = monday + week}}},
+                         {static_cast<std::int64_t>(monday * 1e6), static_cast<std::int64_t>((monday + week) * 1e6)});
+    queries.setRecordings({});
+    for (const auto& [by, lines] :
+         {std::pair("audio_device", "left\t20000\nright\t40000"), std::pair("format", "F32\t40000\nS16\t20000")})
+        EXPECT_EQ(server.select(fmt::format("SELECT name, faults FROM (SELECT name, `sum(faults)` AS faults FROM ({}))"
+                                            " ORDER BY name SETTINGS max_memory_usage = 400000000",
+                                            queries.lines(by, {.withOverUnits = true}, 0))),
+                  lines);
+}
+
+// A person gets the longest lines and one for all others, a program gets all.
+TEST_F(FleetReports, ShowTheLargestLinesOfALongTable)
+{
+    EXPECT_EQ(server.select(fmt::format(
+                  "INSERT INTO stretches (device, epoch, id, began_us, microseconds, session, application)"
+                  " SELECT toFixedString('{0}', 32) AS unit, unit, number, {1} + number * 60000000,"
+                  " if(number < 1000, 7200000000, 3600000000), number + 1, concat('player ', toString(number))"
+                  " FROM numbers(1005)",
+                  unit1, static_cast<std::int64_t>(monday * 1e6))),
+              "");
+    EXPECT_EQ(server.select(fmt::format(
+                  "INSERT INTO events (device, epoch, id, happened_us, name, session, application)"
+                  " SELECT toFixedString('{0}', 32) AS unit, unit, number, {1} + number * 60000000,"
+                  " concat('com.quarn.kesto.Error.', toString(number % 1003)), 1, 'player 0' FROM numbers(2003)",
+                  unit1, static_cast<std::int64_t>(monday * 1e6))),
+              "");
+    const auto countOfLines = [](const std::string& text) { return std::ranges::count(text, '\n'); };
+    const std::string applications = print(inThatWeek({"--by", "application"}));
+    EXPECT_THAT(applications, HasSubstr("\nand 5 more with 5.0 h: --csv shows all\n"));
+    EXPECT_THAT(applications, HasSubstr("\nplayer 999 "));
+    EXPECT_THAT(applications, Not(HasSubstr("\nplayer 1000 ")));
+    EXPECT_THAT(print(thatWeek), HasSubstr("\nand 985 more with 1965 h: --by application shows more\n"));
+    EXPECT_EQ(countOfLines(print(inThatWeek({"--csv", "--by", "application"}))), 1006);
+    EXPECT_EQ(json(thatWeek).find("applications")->array().value().size(), 1005U);
+    EXPECT_THAT(print(inThatWeek({"--html", "-"})), HasSubstr("999 others"));
+    EXPECT_THAT(print(inThatWeek({"--by", "fault"})), HasSubstr("\nand 3 more with 3 faults: --csv shows all\n"));
+    EXPECT_EQ(countOfLines(print(inThatWeek({"--csv", "--by", "fault"}))), 1004);
+}
+
+TEST_F(FleetReports, SayWhenTimesAddUpToMoreThanTheyCan)
+{
+    EXPECT_EQ(server.select(fmt::format("INSERT INTO stretches (device, epoch, id, began_us, microseconds, session)"
+                                        " SELECT toFixedString('{0}', 32) AS unit, unit, number, 86400000000,"
+                                        " 4294967295000000, 1 FROM numbers(6000)",
+                                        unit1)),
+              "");
+    EXPECT_THAT(failure({"--utc", "--since", "1970-01-02"}), HasSubstr("more than 292,000 years together"));
 }
 
 // As the server's settings say while it answers.
