@@ -2,6 +2,7 @@
 // The trial of a whole fleet: ./dev fleet runs it, and the suite runs its small edition.
 #include "fleet/Measures.h"
 #include "fleet/Scenarios.h"
+#include "support/TemporaryDirectory.h"
 
 #include <CLI/CLI.hpp>
 
@@ -9,6 +10,7 @@
 #include <csignal>
 #include <cstdlib>
 #include <exception>
+#include <filesystem>
 #include <fmt/format.h>
 #include <string>
 #include <thread>
@@ -67,13 +69,13 @@ bool play(const Scenario& scenario, Fleet& fleet)
     }
 }
 
-int run(const Edition& edition, const std::string& only)
+// Everything is written to the folder.
+int run(const Edition& edition, const std::string& only, const std::filesystem::path& directory)
 {
     const auto begin = Clock::now();
-    const support::TemporaryDirectory directory;
-    ::setenv("TMPDIR", directory.path().c_str(), 1); // also of what makes a directory of its own
+    ::setenv("TMPDIR", directory.c_str(), 1); // also of what makes a directory of its own
     print(description(edition));
-    Fleet fleet(edition, directory.path());
+    Fleet fleet(edition, directory);
     print(fmt::format("{:7.1f} s                 servers run, and devices have their weeks", secondsSince(begin)));
     for (const Scenario& scenario : allScenarios()) {
         const bool isFirst = &scenario == &allScenarios().front(); // which starts the ingests
@@ -105,13 +107,18 @@ int main(int argc, char** argv)
     std::size_t devices = 0;
     app.add_option("--devices", devices, "so many made-up devices, in place of the edition's")
         ->check(CLI::Range(10, 100'000));
+    std::filesystem::path kept;
+    app.add_option("--keep", kept, "a folder for all stores and logs, which stays, in place of one that goes");
     CLI11_PARSE(app, argc, argv);
     fleet::Edition edition = isSmall ? fleet::smallEdition : fleet::wholeEdition;
     if (devices > 0)
         edition.devices = devices;
     std::signal(SIGPIPE, SIG_IGN);
     try {
-        return fleet::run(edition, only);
+        if (kept.empty())
+            return fleet::run(edition, only, support::TemporaryDirectory().path());
+        std::filesystem::create_directories(kept);
+        return fleet::run(edition, only, std::filesystem::canonical(kept));
     } catch (const std::exception& error) {
         fmt::print(stderr, "kesto_fleet: {}\n", error.what());
         return 2;
