@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstddef>
+#include <limits>
 #include <pthread.h>
 #include <stdexcept>
 
@@ -15,7 +16,7 @@ public:
         pthread_attr_t huge;
         ::pthread_attr_init(&huge);
         const bool isSet = ::pthread_getattr_default_np(&usual_) == 0
-            && ::pthread_attr_setstacksize(&huge, std::size_t{1} << 47) == 0
+            && ::pthread_attr_setstacksize(&huge, std::numeric_limits<std::size_t>::max() / 8 * 7) == 0
             && ::pthread_setattr_default_np(&huge) == 0;
         ::pthread_attr_destroy(&huge);
         if (!isSet)
