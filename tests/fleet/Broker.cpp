@@ -62,6 +62,13 @@ StreamState stateIn(const jsStreamInfo& facts)
     return state;
 }
 
+// The server that leads the consumer may lag behind the one that leads the stream: it then counts too few.
+std::uint64_t undelivered(const jsStreamInfo& stream, const jsConsumerInfo& consumer)
+{
+    const std::uint64_t last = stream.State.LastSeq;
+    return std::max(consumer.NumPending, last - std::min(last, consumer.Delivered.Stream));
+}
+
 } // namespace
 
 Broker::Broker(const std::filesystem::path& directory, int servers, const std::vector<std::string>& credentials)
@@ -125,7 +132,7 @@ StreamState Broker::stream()
         if (js_GetStreamInfo(&facts, context, "KESTO", nullptr, nullptr) == NATS_OK
             && js_GetConsumerInfo(&consumer, context, "KESTO", "ingest", nullptr, nullptr) == NATS_OK) {
             state = stateIn(*facts);
-            state.waiting = consumer->NumPending + static_cast<std::uint64_t>(consumer->NumAckPending);
+            state.waiting = undelivered(*facts, *consumer) + static_cast<std::uint64_t>(consumer->NumAckPending);
         }
         jsConsumerInfo_Destroy(consumer);
         jsStreamInfo_Destroy(facts);
