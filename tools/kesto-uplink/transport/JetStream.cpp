@@ -219,7 +219,7 @@ void JetStream::disconnect()
 
 JetStream::~JetStream()
 {
-    disconnect();
+    JetStream::disconnect();
 }
 
 void JetStream::interrupt()

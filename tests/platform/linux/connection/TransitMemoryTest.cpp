@@ -40,7 +40,7 @@ TEST_F(TransitMemoryTest, HasNoLimitsUntilItGetsSome)
 {
     TransitMemory unlimited([] { });
     const Share share = unlimited.makeShare(alice);
-    unlimited.add(*share, std::size_t{1} << 60);
+    unlimited.add(*share, std::numeric_limits<std::size_t>::max() / 16);
     EXPECT_EQ(unlimited.roomFor(*share, 0), ample);
     EXPECT_EQ(unlimited.excess(*share), None);
 }
