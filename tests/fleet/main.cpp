@@ -69,7 +69,7 @@ bool play(const Scenario& scenario, Fleet& fleet)
     }
 }
 
-// Everything is written to the folder.
+// The trial writes everything to the folder.
 int run(const Edition& edition, const std::string& only, const std::filesystem::path& directory)
 {
     const auto begin = Clock::now();

@@ -157,7 +157,7 @@ private:
     std::array<RowEntry, keyCount>& entries_;
     EmbeddedJson& payload_;
     unsigned depth_ = 0;
-    RowEntry* next_ = nullptr; // whose value comes next; null: nobody's
+    RowEntry* next_ = nullptr; // takes the next value; null: no entry does
     bool isInPayload_ = false;
     std::string reason_;
 };

@@ -277,7 +277,7 @@ TEST(JetStream, aConnectionMayEndWhileConfirmationsCome)
     for (int number = 0; number < connections; ++number) {
         JetStream transport({.urls = {listener.url()}}, alpha, {.connect = 10s, .answer = 5ms});
         ASSERT_TRUE(transport.connect().isStored());
-        EXPECT_FALSE(transport.lastConfirmation("0123")); // nobody answers that
+        EXPECT_FALSE(transport.lastConfirmation("0123")); // the server answers no question
         transport.disconnect();
     }
 }

@@ -1,7 +1,7 @@
 // SPDX-License-Identifier: Apache-2.0
 // Names of columns within a query: u is the hash of the unit, s of its session, k the key; n and r are the numbers of
-// session and row in the device's store. us is how long in microseconds, v the volume in millionths or
-// -1, and f is 1 of a fault. Sums are of whole numbers.
+// session and row in the device's store. us is how long in microseconds, v the volume in millionths or -1, and f is 1
+// of a fault. Sums are of whole numbers.
 //
 // Tables may be distributed over servers. There, a subquery in a condition is GLOBAL: the first server asks it once for
 // all. A list of constants must not be, and constants of one part of a UNION are columns of it by materialize().
@@ -143,10 +143,10 @@ std::string FleetQueries::faults(bool withDevices) const
 std::string FleetQueries::placesOfFaults() const
 {
     const std::string both = fmt::format(
-        "SELECT {0} AS st, session, began_us AS moment, materialize(toUInt8(1)) AS played, id, audio_device AS "
-        "played_on,"
-        " format AS played_as FROM stretches WHERE recording = {1} AND {2} AND (st, session) GLOBAL IN ({3}) UNION ALL"
-        " SELECT {0} AS st, session, happened_us AS moment, materialize(toUInt8(0)) AS played, id,"
+        "SELECT {0} AS st, session, began_us AS moment, materialize(toUInt8(0)) AS fault, id,"
+        " audio_device AS played_on, format AS played_as FROM stretches WHERE recording = {1} AND {2}"
+        " AND (st, session) GLOBAL IN ({3}) UNION ALL"
+        " SELECT {0} AS st, session, happened_us AS moment, materialize(toUInt8(1)) AS fault, id,"
         " materialize('') AS played_on, materialize('') AS played_as FROM events WHERE {4} AND session != 0{5}",
         storeHash, question_.history.isRecording ? 1 : 0, touching(true), sessionsWithFault(true), isFault(),
         direction_);
@@ -154,7 +154,7 @@ std::string FleetQueries::placesOfFaults() const
         "SELECT st, id, played_on, played_as FROM (SELECT st, anyIf(row.4, row.2 = 0) AS played_on,"
         " anyIf(row.5, row.2 = 0) AS played_as, groupArrayIf(row.3, row.2 = 1) AS ids FROM (SELECT st, session, row,"
         " greatest(number, 1) AS place FROM (SELECT st, session,"
-        " arraySort(groupArray((moment, 1 - played, id, played_on, played_as))) AS rows,"
+        " arraySort(groupArray((moment, fault, id, played_on, played_as))) AS rows,"
         " arrayCumSum(arrayMap(x -> 1 - x.2, rows)) AS numbers FROM ({}) GROUP BY st, session)"
         " ARRAY JOIN rows AS row, numbers AS number) GROUP BY st, session, place) ARRAY JOIN ids AS id",
         both);
