@@ -27,6 +27,9 @@ constexpr std::size_t mostEventsAtOnce = 64;
 // come; and so much of one client at once that this takes about that time.
 constexpr std::chrono::microseconds longestReading{25};
 constexpr std::size_t leastRead = 256;
+// What a connection pays for one read at most. Beyond it the thread itself waited for a processor: whoever paid for
+// that would wait until each of the others has used as much.
+constexpr std::chrono::microseconds mostCharged{200};
 
 std::size_t mostConnections(std::size_t descriptors)
 {
@@ -167,7 +170,7 @@ void LinuxConnectionListener::serveReaders()
         const bool hasMore = serve(reader, ready_.isContested() ? reader.mostBytes : ConnectionHub::mostReadAtOnce);
         const auto time = Clock::now() - now;
         reader.adapt(time);
-        ready_.charge(time, hasMore);
+        ready_.charge(std::min<Clock::duration>(time, mostCharged), hasMore);
         now += time;
     }
 }

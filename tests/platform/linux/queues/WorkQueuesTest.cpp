@@ -420,6 +420,22 @@ TEST_F(LanesTest, AUserDoesNotWaitForTheManyLanesOfAnother)
     EXPECT_EQ(std::ranges::count(ran.begin(), ran.begin() + 20, "other"), 5) << "10 would be enough on a quiet machine";
 }
 
+// As when other programs keep the thread from its processor.
+TEST_F(LanesTest, ALanePaysForNoTimeInWhichTheThreadWaits)
+{
+    const auto unlucky = queue->makeLane({1000, 1});
+    const auto other = queue->makeLane({1001, 1});
+    hold();
+    unlucky->submit([] { std::this_thread::sleep_for(50ms); });
+    submit(*unlucky, "unlucky");
+    for (int item = 0; item < 100; ++item)
+        submit(*other, "other", 1ms);
+    go();
+    queue.reset();
+    ASSERT_EQ(ran.size(), 101U);
+    EXPECT_LE(std::ranges::find(ran, "unlucky") - ran.begin(), 10) << "it pays for the sleep if it comes after 50";
+}
+
 TEST_F(LanesTest, TheQueueItselfIsALaneOfItsOwnUser)
 {
     const auto flood = queue->makeLane({1000, 1});
