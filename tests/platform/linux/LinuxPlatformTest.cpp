@@ -75,8 +75,16 @@ TEST_F(LinuxPlatformTest, PreferencesThatChangePostTheNotificationOfTheirDomain)
 TEST_F(LinuxPlatformTest, ItsThreadsAreNoNicerThanTheProcess)
 {
     const LinuxPlatform providers(launch());
-    EXPECT_EQ(support::nicenessBeyondOwn("analytics"), 0);
     EXPECT_EQ(support::nicenessBeyondOwn("configuration"), 0);
+}
+
+// A client's answer waits for both.
+TEST_F(LinuxPlatformTest, ItsStoreHasThePriorityOfTheServerQueue)
+{
+    LinuxPlatform providers(launch());
+    const auto queue = providers.platform().workQueues.makeTurnQueue("com.quarn.kesto.test",
+                                                                     {.quality = QualityOfService::UserInteractive});
+    EXPECT_EQ(support::nicenessBeyondOwn("analytics"), support::nicenessBeyondOwn("kesto.test"));
 }
 
 TEST_F(LinuxPlatformTest, ATurnOfTheServerQueueIsKeptAtItsEnd)

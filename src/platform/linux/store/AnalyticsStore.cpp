@@ -64,7 +64,8 @@ AnalyticsStore::AnalyticsStore(std::unique_ptr<EventKeeper> keeper, Configuratio
         wakeKeeper();
     });
     applyConfiguration();
-    thread_ = startThread("analytics", QualityOfService::Default, [this] { run(); });
+    // Of the priority of the server queue: a client's answer waits for both.
+    thread_ = startThread("analytics", QualityOfService::UserInteractive, [this] { run(); });
 }
 
 AnalyticsStore::~AnalyticsStore()
