@@ -10,12 +10,12 @@ namespace {
 
 constexpr std::chrono::seconds timeToReturn{10};
 
+// A service has as long to finish what a flood left behind as it has to return the memory.
 bool comesToRest(pid_t process)
 {
-    constexpr std::chrono::seconds patience(1);
     constexpr std::chrono::milliseconds look(50);
     constexpr double almostNothing = 0.005; // seconds of processor time meanwhile
-    for (const auto start = Clock::now(); Clock::now() - start < patience;) {
+    for (const auto start = Clock::now(); Clock::now() - start < timeToReturn;) {
         const double before = processorSeconds(process);
         std::this_thread::sleep_for(look);
         if (processorSeconds(process) - before < almostNothing)

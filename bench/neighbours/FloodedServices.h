@@ -15,8 +15,8 @@ namespace bench {
 
 class FloodedServices {
 public:
-    // A service that still works long after the flood would disturb the next measurement: it ends, and counts with the
-    // memory that it has at that moment.
+    // Waits until the service has done what the flood left behind. One that still works after ten seconds would disturb
+    // the next measurement: it ends, and counts with the memory that it has at that moment.
     void add(std::string_view flood, std::unique_ptr<ServiceProcess> service, double megabytesBefore);
     // Waits, and adds a row for the flood that left most.
     void reportTo(Report& report);
