@@ -5,6 +5,7 @@
 #include "platform/linux/LaunchConfiguration.h"
 #include "platform/linux/LinuxPlatform.h"
 #include "platform/linux/connection/LinuxConnectionListener.h"
+#include "platform/linux/process/DescriptorTable.h"
 #include "platform/linux/process/EndSignals.h"
 #include "platform/linux/process/ServiceManager.h"
 #include "service/KestoReportingServiceDelegate.h"
@@ -100,9 +101,13 @@ ledger::MemoryState memoryState()
             .limitOfAClient = limits.ofAClient};
 }
 
+// As many clients as a device has, with room to spare; 128 KiB of the kernel's memory.
+constexpr std::size_t usualDescriptors = 16'384;
+
 int run()
 {
-    platform::EndSignals endSignals; // first, because every thread must block them
+    platform::reserveDescriptors(usualDescriptors); // first: it is quick only while there is one thread
+    platform::EndSignals endSignals; // before any other thread, because each must block them
     auto launch = platform::LaunchConfiguration::fromEnvironment();
     if (!launch)
         return cannotRun(launch.error());
