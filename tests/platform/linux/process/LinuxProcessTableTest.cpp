@@ -18,11 +18,11 @@ namespace {
 using namespace std::chrono_literals;
 using support::NamedProcess;
 
-std::chrono::nanoseconds now{};
+std::chrono::nanoseconds timeOfTheTest{};
 
 std::chrono::nanoseconds currentTime()
 {
-    return now;
+    return timeOfTheTest;
 }
 
 class LinuxProcessTableTest : public testing::Test {
@@ -68,9 +68,9 @@ TEST_F(LinuxProcessTableTest, BelievesANameForASecond)
     NamedProcess process("before");
     EXPECT_EQ(nameOf(process.identifier()), "before");
     process.rename("after");
-    now += 1s - 1ns;
+    timeOfTheTest += 1s - 1ns;
     EXPECT_EQ(nameOf(process.identifier()), "before");
-    now += 1ns;
+    timeOfTheTest += 1ns;
     EXPECT_EQ(nameOf(process.identifier()), "after");
 }
 
@@ -91,10 +91,10 @@ TEST_F(LinuxProcessTableTest, NamesAreAlwaysUtf8)
     NamedProcess process("\xff\xfe player \xc3\xa9");
     EXPECT_EQ(nameOf(process.identifier()), "?? player é");
     process.rename("cut character\xe9\x9f"); // as the kernel leaves it when it cuts a name
-    now += 1s;
+    timeOfTheTest += 1s;
     EXPECT_EQ(nameOf(process.identifier()), "cut character??");
     process.rename(std::string("\xed\xa0\x80 \xc0\xaf \xf0\x9f\x8e\xb5", 11));
-    now += 1s;
+    timeOfTheTest += 1s;
     EXPECT_EQ(nameOf(process.identifier()), "??? ?? \xf0\x9f\x8e\xb5");
 }
 
@@ -103,7 +103,7 @@ TEST_F(LinuxProcessTableTest, ANameMayHoldAnythingElse)
     NamedProcess process("a b) S\n1");
     EXPECT_EQ(nameOf(process.identifier()), "a b) S\n1");
     process.rename("");
-    now += 1s;
+    timeOfTheTest += 1s;
     EXPECT_EQ(nameOf(process.identifier()), "");
 }
 
