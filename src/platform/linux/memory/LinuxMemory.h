@@ -5,7 +5,8 @@
 // An allocator keeps freed memory for the next request, and returns it to the system only in the course of later
 // requests: a service that falls idle after a long session would keep that session's memory for ever. It returns after
 // some seconds, not immediately, for two reasons: the next session would pay again for the first touch of every page,
-// and the threads that write what a session left still use it.
+// and the threads that write what a session left still use it. It returns while the service rests: a thread with a heap
+// of thousands of clients tidies it for 50 ms, and nobody should wait for that.
 #pragma once
 
 #include "platform/Memory.h"
@@ -25,13 +26,21 @@ public:
     // From the moment when `much` bytes are free until the heaps are tidied, and until all threads have done that.
     static constexpr std::chrono::seconds delay{5};
     static constexpr std::chrono::seconds timeToTidy{1};
+    // The service rests if it used less than this time of a processor in the last second. If it never rests, the heaps
+    // are tidied a minute later.
+    static constexpr std::chrono::milliseconds timeOfRest{100};
+    static constexpr int mostSecondsWithoutRest = 60;
 
-    // The bytes of memory that this process has from the system.
-    static std::size_t residentBytes();
+    // What the system says of a process.
+    struct Process {
+        std::size_t (*residentBytes)(); // of memory that it has from the system
+        std::chrono::nanoseconds (*usedTime)(); // of all processors, since its start
+    };
+    static const Process thisProcess;
 
     // limits.toml in the configuration directory has the limits; the log reports wrong values in it.
     LinuxMemory(WorkQueues& queues, ConfigurationWatcher& watcher, ProviderLog log,
-                std::size_t (*resident)() = residentBytes);
+                const Process& process = thisProcess);
 
     void letGo(std::size_t bytes) override;
     void clientGone() override;
@@ -39,11 +48,12 @@ public:
 
 private:
     void applyLimits();
+    void tidyAtRest(int secondsLeft);
     void tidy();
 
     WorkQueues& queues_;
     const ProviderLog log_;
-    std::size_t (*const resident_)();
+    const Process process_;
     std::atomic<std::size_t> bytes_ = 0; // since the heaps were last tidied
     std::atomic<std::size_t> residentWhenTidy_; // when they were last tidied, or at the start
     std::atomic<std::size_t> mostOfTheService_ = 0;

@@ -7,10 +7,12 @@
 #include "support/fakes/FakeLog.h"
 #include "support/fakes/FakeWorkQueues.h"
 
+#include <ctime>
 #include <gmock/gmock.h>
 #include <gtest/gtest.h>
 #include <limits>
 #include <thread>
+#include <vector>
 
 namespace platform {
 namespace {
@@ -21,6 +23,7 @@ constexpr std::size_t megabyte = std::size_t{1} << 20;
 
 constexpr std::size_t megabytesAtFirst = 20; // `memory` notes them when it is made
 std::size_t megabytesOfTheProcess = megabytesAtFirst;
+std::chrono::nanoseconds timeOfTheProcess{};
 
 class LinuxMemoryTest : public testing::Test {
 protected:
@@ -43,7 +46,11 @@ protected:
     ConfigurationWatcher watcher{directory.path(), ProviderLog(log)};
     support::FakeClock clock;
     support::FakeWorkQueues queues{clock};
-    LinuxMemory memory{queues, watcher, ProviderLog(log), [] { return megabytesOfTheProcess * megabyte; }};
+    LinuxMemory memory{queues,
+                       watcher,
+                       ProviderLog(log),
+                       {.residentBytes = [] { return megabytesOfTheProcess * megabyte; },
+                        .usedTime = [] { return timeOfTheProcess; }}};
     int wakings = 0;
     ThreadHeap heap{[this] { ++wakings; }};
 };
@@ -68,6 +75,32 @@ TEST_F(LinuxMemoryTest, WakesTheThreadsFiveSecondsAfterMuchWasLetGo)
     queues.advance(1ns);
     EXPECT_EQ(wakings, 1) << "small amounts add up";
     EXPECT_TRUE(heap.isAsked());
+}
+
+TEST_F(LinuxMemoryTest, WaitsForASecondInWhichTheServiceRests)
+{
+    memory.letGo(4 * megabyte);
+    queues.advance(4s);
+    timeOfTheProcess += 100ms;
+    queues.advance(1s);
+    EXPECT_EQ(wakings, 0) << "a client would wait for the threads that tidy";
+    timeOfTheProcess += 100ms - 1ns;
+    queues.advance(1s);
+    EXPECT_EQ(wakings, 1);
+}
+
+TEST_F(LinuxMemoryTest, WaitsAMinuteAtMostForAServiceThatNeverRests)
+{
+    memory.letGo(4 * megabyte);
+    queues.advance(4s);
+    for (int second = 0; second < 60; ++second) {
+        timeOfTheProcess += 100ms;
+        queues.advance(1s);
+    }
+    EXPECT_EQ(wakings, 0);
+    timeOfTheProcess += 100ms;
+    queues.advance(1s);
+    EXPECT_EQ(wakings, 1);
 }
 
 TEST_F(LinuxMemoryTest, WakesThemOnceForAllThatWasLetGoMeanwhile)
@@ -127,8 +160,22 @@ TEST_F(LinuxMemoryTest, ComparesWithTheSizeOnceTheThreadsHaveTidied)
 
 TEST_F(LinuxMemoryTest, KnowsTheSizeOfThisProcess)
 {
-    EXPECT_GT(LinuxMemory::residentBytes(), megabyte);
-    EXPECT_LT(LinuxMemory::residentBytes(), 4096 * megabyte);
+    EXPECT_GT(LinuxMemory::thisProcess.residentBytes(), megabyte);
+    EXPECT_LT(LinuxMemory::thisProcess.residentBytes(), 4096 * megabyte);
+    constexpr std::size_t more = 64 * megabyte;
+    const std::size_t before = LinuxMemory::thisProcess.residentBytes();
+    const std::vector<char> touched(more, 'x');
+    EXPECT_GT(LinuxMemory::thisProcess.residentBytes(), before + more / 2);
+}
+
+TEST_F(LinuxMemoryTest, KnowsTheTimeThatThisProcessUsed)
+{
+    const auto before = LinuxMemory::thisProcess.usedTime();
+    timespec waste = {};
+    for (const auto end = std::chrono::steady_clock::now() + 20ms; std::chrono::steady_clock::now() < end;)
+        ::clock_gettime(CLOCK_MONOTONIC, &waste);
+    EXPECT_GT(LinuxMemory::thisProcess.usedTime(), before);
+    EXPECT_LT(LinuxMemory::thisProcess.usedTime(), 1h);
 }
 
 // --- the limits
