@@ -27,8 +27,8 @@ constexpr std::size_t mostEventsAtOnce = 64;
 // come; and so much of one client at once that this takes about that time.
 constexpr std::chrono::microseconds longestReading{25};
 constexpr std::size_t leastRead = 256;
-// What a connection pays for one read at most. Beyond it the thread itself waited for a processor: whoever paid for
-// that would wait until each of the others has used as much.
+// One read costs its connection this much at most. A longer read means that the thread waited for a processor. A
+// connection that paid for this wait would then wait until every other connection has used as much time.
 constexpr std::chrono::microseconds mostCharged{200};
 
 std::size_t mostConnections(std::size_t descriptors)

@@ -21,9 +21,9 @@ namespace {
 
 constexpr int partIfContested = 4; // of the longest turn
 
-// Says how long items take. Where lanes compete that is processor time: if a lane paid for the time in which the thread
-// itself waited for a processor, it would then wait until each of the others has used as much. Reading that clock takes
-// 0.5 us, so otherwise the time that passes is good enough. For the thread that runs the items.
+// Says how long items take. While lanes compete, it counts processor time: a lane that paid for the thread's wait for a
+// processor would then wait until every other lane has used as much time. A look at that clock takes 0.5 us. So it
+// counts the time that passes while one lane is alone. Used by the thread that runs the items.
 class Stopwatch {
 public:
     // Before the items run.
