@@ -88,6 +88,7 @@ public:
     void setInterruptionHandler(EndHandler) override { }
     void setInvalidationHandler(EndHandler) override { }
     void setLane(std::shared_ptr<platform::Lane>, std::shared_ptr<ledger::Workload>) override { }
+    void setLogShare(std::shared_ptr<platform::LogShare>) override { }
     void resume() override { }
     void send(platform::Turn&, std::string frame) override { sent.push_back(std::move(frame)); }
     void write(std::string) override { }

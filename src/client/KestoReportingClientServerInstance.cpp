@@ -28,10 +28,10 @@ bool isRegistered(const KestoReportingServiceDelegateProtocol& delegate,
 
 KestoReportingClientServerInstance::KestoReportingClientServerInstance(
     std::int32_t processIdentifier, std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate,
-    std::uint32_t userIdentifier)
+    std::uint32_t userIdentifier, std::shared_ptr<platform::LogShare> logShare)
     : processIdentifier_(processIdentifier),
       userIdentifier_(userIdentifier),
-      logShare_(std::make_shared<platform::LogShare>(foundation::format("client {}", processIdentifier))),
+      logShare_(std::move(logShare)),
       delegate_(std::move(delegate)),
       budget_(session::StorageBudget::makeForClient(userIdentifier))
 {
@@ -46,8 +46,9 @@ KestoReportingClientServerInstance::~KestoReportingClientServerInstance()
         platform::current().ledger.count(Counter::SessionsGone, clientReportingSessionMap_.size());
         platform::current().memory.clientGone();
     }
-    const platform::LogShare::Writing forNoShare(nullptr);
-    platform::reportLeftOutLines(*logShare_);
+    const platform::LogShare::Writing aboutConnection(logShare_.get(), platform::LogShare::About::Connections);
+    if (logShare_ != nullptr)
+        platform::reportLeftOutLines(*logShare_);
     if (sessionsRefused_ != 0)
         KESTO_LOG(KestoReportingClientCategory(), Error,
                   "client {} was refused {} sessions: it may have {}, and all clients {}", processIdentifier_,
@@ -421,7 +422,7 @@ void KestoReportingClientServerInstance::leave(platform::Turn& turn)
         now.events.announceSourceEnd({self.source_, platform::current().clock.secondsSince1970()});
         if (const auto delegate = self.delegate_.lock())
             delegate->removeClient(self.shared_from_this());
-        const platform::LogShare::Writing forNoShare(nullptr); // of a client that flooded, too
+        const platform::LogShare::Writing aboutConnection(self.logShare_.get(), platform::LogShare::About::Connections);
         KESTO_LOG(KestoReportingClientCategory(), Default, "removing {} from the server client list",
                   self.processIdentifier_);
     });

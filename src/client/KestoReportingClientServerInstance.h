@@ -39,7 +39,8 @@ public:
 
     KestoReportingClientServerInstance(std::int32_t processIdentifier,
                                        std::weak_ptr<KestoReportingServiceDelegateProtocol> delegate,
-                                       std::uint32_t userIdentifier = 0);
+                                       std::uint32_t userIdentifier = 0,
+                                       std::shared_ptr<platform::LogShare> logShare = nullptr);
     ~KestoReportingClientServerInstance() override;
     KestoReportingClientServerInstance(const KestoReportingClientServerInstance&) = delete;
     KestoReportingClientServerInstance& operator=(const KestoReportingClientServerInstance&) = delete;
@@ -210,7 +211,7 @@ private:
     const std::int32_t processIdentifier_;
     const std::uint32_t userIdentifier_;
     const std::uint64_t source_ = platform::nextOriginNumber();
-    const std::shared_ptr<platform::LogShare> logShare_; // of everything that the client causes
+    const std::shared_ptr<platform::LogShare> logShare_; // of everything that the client causes; null: no limit
     const std::shared_ptr<platform::Lane> queue_ =
         utility::serverQueue()->makeLane({.user = userIdentifier_, .process = processIdentifier_});
     std::optional<double> clientStartDate_ KESTO_GUARDED_BY(registrationLock_);

@@ -55,7 +55,8 @@ enum class Counter : std::uint8_t {
     StretchesLeftOut,
 
     ConnectionsAccepted,
-    ConnectionsRefused,
+    ConnectionsRefused, // because of their user's others
+    ConnectionsRefusedUnfinished, // because of those that ended
     ConnectionsEnded,
     ConnectionsInterrupted,
     AcceptingPauses,

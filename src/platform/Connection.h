@@ -76,6 +76,9 @@ public:
     // makes the service do counts in the workload. Before `resume`.
     virtual void setLane(std::shared_ptr<Lane> lane, std::shared_ptr<ledger::Workload> workload) = 0;
 
+    // What is written to the log about the connection's end counts in that share. Before `resume`.
+    virtual void setLogShare(std::shared_ptr<LogShare> share) = 0;
+
     // Starts reading. Connection thread, in `shouldAcceptNewConnection`.
     virtual void resume() = 0;
 

@@ -35,6 +35,14 @@ void report(const LogShare& share, std::uint64_t leftOut)
               share.who(), leftOut, LogShare::mostAtOnce, LogShare::perSecond);
 }
 
+LogShare::Part partFor(LogLevel level)
+{
+    using enum LogShare::Part;
+    if (LogShare::aboutOfThisThread() == LogShare::About::Connections)
+        return Connections;
+    return level == LogLevel::Error ? Errors : Others;
+}
+
 // Whether the line is within the share for which the thread writes.
 bool isAdmitted(LogLevel level)
 {
@@ -42,7 +50,7 @@ bool isAdmitted(LogLevel level)
     if (share == nullptr)
         return true;
     const auto now = LogShare::Clock::now();
-    if (!share->take(level == LogLevel::Error ? LogShare::Part::Errors : LogShare::Part::Others, now)) {
+    if (!share->take(partFor(level), now)) {
         current().ledger.count(ledger::Counter::LogLinesLeftOut);
         return false;
     }
@@ -55,7 +63,7 @@ bool isAdmitted(LogLevel level)
 
 void reportLeftOutLines(LogShare& share)
 {
-    if (const std::uint64_t leftOut = share.takeLeftOut(); leftOut != 0)
+    if (const std::uint64_t leftOut = share.takeLeftOutAtEnd(LogShare::Clock::now()); leftOut != 0)
         report(share, leftOut);
 }
 

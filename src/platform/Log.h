@@ -91,7 +91,8 @@ public:
 // The prefix that every line starts with: the name right-aligned in 25 columns, the line left-aligned in 5.
 [[nodiscard]] std::string logPrefix(const LogLocation& location);
 
-// Writes how many lines of the share were left out since the last report. For the end of its client.
+// Writes how many lines of the share were left out since the last report, if it has a line left for that. For the end
+// of a client.
 void reportLeftOutLines(LogShare& share);
 
 // Formats the message and hands it to the current platform's log, unless the calling thread writes for a share that has

@@ -9,6 +9,7 @@
 #include "driver/KestoReportingDriverUtility.h"
 #include "foundation/Mutex.h"
 #include "platform/Connection.h"
+#include "service/LogShares.h"
 #include "service/ReporterIndex.h"
 #include "sinks/KestoReportingVorpStateManagerUtility.h"
 #include "utility/ServerQueue.h"
@@ -105,6 +106,8 @@ private:
     const std::shared_ptr<client::SessionEnds> sessionEnds_ = std::make_shared<client::SessionEnds>();
     const foundation::Dictionary defaults_;
     std::unique_ptr<KestoReportingUtilityVorpStateManager> vorpStateManager_; // on internal builds only
+
+    service::LogShares logShares_; // only for the connection thread
 
     foundation::Mutex lock_;
     service::ReporterIndex reporterIndex_ KESTO_GUARDED_BY(lock_);

@@ -15,12 +15,14 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
 {
     using Client = KestoReportingClientServerInstance;
     const std::int32_t processIdentifier = connection->processIdentifier();
+    const auto logShare = logShares_.ofProcess({.user = connection->userIdentifier(), .process = processIdentifier});
+    const platform::LogShare::Writing aboutConnection(logShare.get(), platform::LogShare::About::Connections);
     KESTO_LOG(KestoReportingServiceDelegateCategory(), Default, "newConnection: {}", connection->description());
 
     std::shared_ptr<Client> client;
     {
         const foundation::Lock lock(lock_);
-        client = std::make_shared<Client>(processIdentifier, weak_from_this(), connection->userIdentifier());
+        client = std::make_shared<Client>(processIdentifier, weak_from_this(), connection->userIdentifier(), logShare);
         connection->setCallHandler(
             [adapter = client::ServiceProtocolAdapter(client, platform::current().ledger)](
                 platform::Connection::Call call) mutable { return adapter.handleCall(std::move(call)); });
@@ -29,6 +31,7 @@ bool KestoReportingServiceDelegate::shouldAcceptNewConnection(platform::Connecti
     ledger::Workloads& workloads = platform::current().ledger.workloads();
     const auto workload = workloads.open(connection->userIdentifier());
     connection->setLane(client->queue(), workload);
+    connection->setLogShare(logShare);
     client->queue()->submit([self = shared_from_this(), weakClient, workload, &workloads](platform::Turn& turn) {
         if (const auto registered = weakClient.lock()) {
             self->registerClient(turn, registered);

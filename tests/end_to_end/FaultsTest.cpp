@@ -1,5 +1,6 @@
 // SPDX-License-Identifier: Apache-2.0
 // Faults of every kind, and what the ledger says after each: nothing goes uncounted.
+#include "end_to_end/AnotherProcess.h"
 #include "end_to_end/Disks.h"
 #include "end_to_end/Kestod.h"
 #include "end_to_end/Sums.h"
@@ -562,6 +563,25 @@ TEST(FloodedLogTest, AClientThatCallsTooOftenLosesItsOwnLinesOnly)
     EXPECT_EQ(kestod.countInLog("validating reporter 4711\n"), 1U);
 }
 
+TEST(FloodedLogTest, AProcessThatComesAndGoesTooOftenLosesItsOwnLinesOnly)
+{
+    Kestod kestod({}, {{"KESTO_LOG", "default"}});
+    kestod.startAndAwait();
+    constexpr std::size_t connections = 5'000;
+    constexpr std::size_t linesOfEach = 5; // about the connection itself
+    for (std::size_t number = 0; number < connections; ++number)
+        WireClient(kestod.socketPath()).ask(Create, 1);
+    EXPECT_TRUE(waitUntil([&] { return readLedger(kestod)[Counter::SessionsGone] == connections; }));
+    EXPECT_TRUE(doInAnotherProcess([&] { WireClient(kestod.socketPath()).ask(Validate, 4711); }));
+    EXPECT_TRUE(waitUntil([&] { return kestod.countInLog("validating reporter 4711\n") == 1; }));
+    const std::size_t written = kestod.countInLog("newConnection: ") + kestod.countInLog("new client with pid")
+        + kestod.countInLog("removing ") + kestod.countInLog("dealloc ")
+        + kestod.countInLog("invalidationHandler: connection exited");
+    EXPECT_GE(written, 2000U);
+    EXPECT_LT(written, linesOfEach * connections / 2);
+    EXPECT_GT(readLedger(kestod)[Counter::LogLinesLeftOut], linesOfEach * connections / 2);
+}
+
 TEST(BlockedLogTest, CallsAreAnsweredAndLinesThatAreLostAreCounted)
 {
     std::array<int, 2> ends{};
@@ -570,14 +590,15 @@ TEST(BlockedLogTest, CallsAreAnsweredAndLinesThatAreLostAreCounted)
     const platform::FileDescriptor writer(ends[1]);
     Kestod kestod({}, {{"KESTO_LOG", "default"}});
     kestod.start({.standardError = writer.get()});
-    constexpr int callsOfAClient = 1500; // each with a line, and within the client's share
-    for (int count = 0; count < 8; ++count) { // more than may wait
-        WireClient client(kestod.socketPath());
-        for (int call = 0; call < callsOfAClient; ++call)
-            client.call(Validate, 1);
-        for (int call = 0; call < callsOfAClient; ++call)
-            ASSERT_TRUE(client.nextReply());
-    }
+    constexpr int callsOfAProcess = 1500; // each with a line, and within the process's share
+    for (int count = 0; count < 8; ++count) // more than may wait
+        ASSERT_TRUE(doInAnotherProcess([&] {
+            WireClient client(kestod.socketPath());
+            for (int call = 0; call < callsOfAProcess; ++call)
+                client.call(Validate, 1);
+            for (int call = 0; call < callsOfAProcess; ++call)
+                std::ignore = client.nextReply().value();
+        }));
     const ledger::Account account = readLedger(kestod);
     EXPECT_GT(account[Counter::LogLinesLost], 0U);
     EXPECT_EQ(account[Counter::LogLinesLeftOut], 0U);

@@ -81,7 +81,7 @@ TEST(Report, HasCountsWithinGroupsAlsoWhenTheyAre0)
     EXPECT_EQ(at(whole, "frames").text(), R"({"refused":{"tooLong":0,"notCbor":0,"cutOff":0,"notACall":0}})");
     EXPECT_EQ(at(whole, "sinceStart.refused.memory"), Value(0));
     EXPECT_EQ(at(whole, "connections").text(),
-              R"({"accepted":0,"refused":{"userLimit":0},"ended":0,"interrupted":0,"acceptingPauses":0,)"
+              R"({"accepted":0,"refused":{"userLimit":0,"unfinished":0},"ended":0,"interrupted":0,"acceptingPauses":0,)"
               R"("readingPauses":0,"memoryPauses":0,"answerBytesDropped":0})");
 }
 

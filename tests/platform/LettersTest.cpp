@@ -25,6 +25,7 @@ public:
     void setInterruptionHandler(EndHandler /*handler*/) override { }
     void setInvalidationHandler(EndHandler /*handler*/) override { }
     void setLane(std::shared_ptr<Lane>, std::shared_ptr<ledger::Workload>) override { }
+    void setLogShare(std::shared_ptr<LogShare>) override { }
     void resume() override { }
     void send(Turn& /*turn*/, std::string /*frame*/) override { }
     void write(std::string letter) override { post_.push_back(name_ + ": " + letter); }

@@ -151,6 +151,19 @@ TEST_F(LogTest, AThreadThatWritesForAShareLeavesOutWhatGoesBeyondIt)
     EXPECT_THAT(platform_.log.take(), testing::IsEmpty());
 }
 
+TEST_F(LogTest, LinesAboutConnectionsHaveAPartOfTheirOwn)
+{
+    LogShare share("process 7");
+    const LogShare::Writing aboutConnection(&share, LogShare::About::Connections);
+    for (int line = 0; line < 10'000; ++line)
+        KESTO_LOG(category_, Error, "comes and goes");
+    EXPECT_LT(std::ranges::count(platform_.log.take(), "comes and goes", &support::LogLine::message), 5000);
+    EXPECT_GT(platform_.ledger.account()[ledger::Counter::LogLinesLeftOut], 5000U);
+    const LogShare::Writing aboutCalls(&share);
+    KESTO_LOG(category_, Default, "a call");
+    EXPECT_THAT(platform_.log.take(), testing::Contains(IsLine(LogLevel::Default, "test", "a call")));
+}
+
 // A category must neither ask an uninstalled log for a threshold nor keep one without a log.
 TEST(LogWithoutPlatform, DropsStatementsAndRemembersNothing)
 {

@@ -60,6 +60,7 @@ public:
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
     // A lane of the fake queues is never full.
     void setLane(std::shared_ptr<platform::Lane>, std::shared_ptr<ledger::Workload>) override { }
+    void setLogShare(std::shared_ptr<platform::LogShare>) override { }
     // All handlers must be installed before.
     void resume() override;
     void send(platform::Turn& turn, std::string frame) override;

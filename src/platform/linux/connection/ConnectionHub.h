@@ -7,6 +7,7 @@
 #include "platform/Connection.h"
 #include "platform/Log.h"
 #include "platform/linux/connection/TransitMemory.h"
+#include "platform/linux/connection/UnfinishedEnds.h"
 #include "platform/linux/files/FileDescriptor.h"
 
 #include <array>
@@ -41,6 +42,7 @@ struct ConnectionHub {
     void wakeUp() const { ::eventfd_write(wake.get(), 1); }
 
     TransitMemory transit{[this] { wakeUp(); }};
+    UnfinishedEnds unfinishedEnds = {};
     // All that are not over.
     foundation::Mutex connectionsLock = {};
     std::map<const void*, std::weak_ptr<LinuxConnection>> connections KESTO_GUARDED_BY(connectionsLock) = {};

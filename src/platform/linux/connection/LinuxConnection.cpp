@@ -529,9 +529,20 @@ void LinuxConnection::breakOffLocked(std::string reason)
     ::shutdown(socket_.get(), SHUT_RDWR);
 }
 
+// The end is carried out when all items of the lane have run.
+void LinuxConnection::countUnfinishedEnd()
+{
+    if (lane_ == nullptr)
+        return;
+    const Submitter process{.user = peer_.userIdentifier, .process = peer_.processIdentifier};
+    hub_->unfinishedEnds.add(process);
+    lane_->submit([hub = hub_, process](Turn&) { hub->unfinishedEnds.remove(process); });
+}
+
 void LinuxConnection::end(std::optional<std::string> interruptedBecause)
 {
     assert(hub_->isConnectionThread());
+    const LogShare::Writing aboutConnection(logShare_.get(), LogShare::About::Connections);
     std::uint64_t readingPauses = 0;
     {
         const foundation::Lock lock(lock_);
@@ -565,6 +576,7 @@ void LinuxConnection::end(std::optional<std::string> interruptedBecause)
     }
     if (invalidationHandler_)
         invalidationHandler_();
+    countUnfinishedEnd();
     // Only after both calls: the call handler owns what they end, and every handler may own the connection.
     callHandler_ = nullptr;
     interruptionHandler_ = nullptr;

@@ -63,6 +63,7 @@ public:
     void setInterruptionHandler(EndHandler handler) override { interruptionHandler_ = std::move(handler); }
     void setInvalidationHandler(EndHandler handler) override { invalidationHandler_ = std::move(handler); }
     void setLane(std::shared_ptr<Lane> lane, std::shared_ptr<ledger::Workload> workload) override;
+    void setLogShare(std::shared_ptr<LogShare> share) override { logShare_ = std::move(share); }
     void resume() override;
     void send(Turn& turn, std::string frame) override;
     void write(std::string frames) override;
@@ -113,6 +114,7 @@ private:
     void giveUp();
     void breakOff(std::string reason);
     void breakOffLocked(std::string reason) KESTO_REQUIRES(lock_);
+    void countUnfinishedEnd();
     void end(std::optional<std::string> interruptedBecause);
 
     void startOutput(std::string_view frame, const EmitterDescriptors* descriptors) KESTO_REQUIRES(lock_);
@@ -129,6 +131,7 @@ private:
     // Only for the connection thread.
     std::shared_ptr<Lane> lane_; // null: it is never full
     std::shared_ptr<ledger::Workload> workload_; // null without a lane
+    std::shared_ptr<LogShare> logShare_; // null: it writes for nobody
     CallHandler callHandler_;
     EndHandler interruptionHandler_;
     EndHandler invalidationHandler_;

@@ -221,20 +221,14 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     socklen_t size = sizeof peer;
     if (::getsockopt(socket.get(), SOL_SOCKET, SO_PEERCRED, &peer, &size) != 0)
         return; // it has gone already
-    User& user = users_[peer.uid];
-    if (user.connections == mostConnectionsOfAUser_) {
-        hub_->ledger.count(ledger::Counter::ConnectionsRefused);
-        if (!std::exchange(user.refusalIsLogged, true))
-            KESTO_LOG(hub_->log, Error, "user {} has {} connections and gets no more until one ends", peer.uid,
-                      user.connections);
+    const Submitter process{.user = peer.uid, .process = peer.pid};
+    if (!admit(process))
         return;
-    }
-    ++user.connections;
     const auto connection =
         std::make_shared<LinuxConnection>(hub_, std::move(socket), LinuxConnection::Peer{peer.pid, peer.uid, peer.gid});
     const auto reader = std::make_shared<Reader>();
     reader->connection = connection;
-    ready_.admit(*reader, {.user = peer.uid, .process = peer.pid});
+    ready_.admit(*reader, process);
     connections_.emplace(connection.get(), reader);
     {
         const foundation::Lock lock(hub_->connectionsLock);
@@ -246,11 +240,36 @@ void LinuxConnectionListener::welcome(FileDescriptor socket)
     ready_.enter(reader); // it may be over already
 }
 
+// Counts a new connection, unless its user has too many already or its process ends them too fast.
+bool LinuxConnectionListener::admit(const Submitter& process)
+{
+    if (const auto refusal = hub_->unfinishedEnds.refusal(process)) {
+        hub_->ledger.count(ledger::Counter::ConnectionsRefusedUnfinished);
+        if (refusal->isFirst)
+            KESTO_LOG(hub_->log, Error,
+                      "process {} gets no more connections for now: {} of its own have ended and are not removed yet, "
+                      "and {} of user {} in all",
+                      process.process, refusal->endsOfProcess, refusal->endsOfUser, process.user);
+        return false;
+    }
+    User& user = users_[process.user];
+    if (user.connections == mostConnectionsOfAUser_) {
+        hub_->ledger.count(ledger::Counter::ConnectionsRefused);
+        if (!std::exchange(user.refusalIsLogged, true))
+            KESTO_LOG(hub_->log, Error, "user {} has {} connections and gets no more until one ends", process.user,
+                      user.connections);
+        return false;
+    }
+    ++user.connections;
+    return true;
+}
+
 void LinuxConnectionListener::forget(const LinuxConnection& connection)
 {
     const auto user = users_.find(connection.userIdentifier());
-    user->second.refusalIsLogged = false;
-    if (--user->second.connections == 0)
+    if (--user->second.connections <= mostConnectionsOfAUser_ / 2)
+        user->second.refusalIsLogged = false;
+    if (user->second.connections == 0)
         users_.erase(user);
     const auto known = connections_.find(&connection);
     waitingForRoom_.erase(known->second);

@@ -87,7 +87,7 @@ private:
     // A user with connections.
     struct User {
         std::size_t connections = 0;
-        bool refusalIsLogged = false; // since one of the connections ended
+        bool refusalIsLogged = false; // since half of the connections ended
     };
 
     // A connection whose socket has something for it.
@@ -111,6 +111,7 @@ private:
     [[nodiscard]] bool serve(Reader& reader, std::size_t mostBytes);
     void acceptWaiting();
     void welcome(FileDescriptor socket);
+    [[nodiscard]] bool admit(const Submitter& process);
     void forget(const LinuxConnection& connection);
     void pauseAccepting(std::optional<Clock::duration> pause, int error);
     void resumeAccepting();

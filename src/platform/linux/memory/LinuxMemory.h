@@ -6,7 +6,7 @@
 // requests: a service that falls idle after a long session would keep that session's memory for ever. It returns after
 // some seconds, not immediately, for two reasons: the next session would pay again for the first touch of every page,
 // and the threads that write what a session left still use it. It returns while the service rests: a thread with a heap
-// of thousands of clients tidies it for 50 ms, and nobody should wait for that.
+// of thousands of clients tidies it for 50 ms, and a call that came meanwhile would wait for that thread.
 #pragma once
 
 #include "platform/Memory.h"

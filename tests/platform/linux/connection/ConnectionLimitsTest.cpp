@@ -245,6 +245,44 @@ TEST_F(ConnectionLimits, ReadingStopsWhileTheLaneIsFullAndNoPauseIsCounted)
     stop();
 }
 
+// The program makes connections faster than the queue, which here waits, can remove them.
+TEST_F(ConnectionLimits, AProcessWhoseEndsWaitGetsNoMoreConnectionsUntilTheyAreCarriedOut)
+{
+    constexpr std::size_t most = 16'384;
+    LinuxWorkQueues queues;
+    const auto queue = queues.makeTurnQueue("server", {});
+    const auto mayRun = queues.makeSemaphore(0);
+    queue->submit([&] { mayRun->wait(); });
+    beforeResuming = [&](Connection& connection) {
+        connection.setLane(queue->makeLane({connection.userIdentifier(), connection.processIdentifier()}),
+                           ledger.workloads().open(connection.userIdentifier()));
+    };
+    listen();
+    for (std::size_t connection = 0; connection < most; ++connection)
+        SocketClient(path).close();
+    ASSERT_TRUE(waitForCount(Counter::ConnectionsEnded, most));
+    EXPECT_EQ(counted(Counter::ConnectionsRefusedUnfinished), 0U);
+
+    for (int attempt = 0; attempt < 3; ++attempt)
+        EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt) << "it is closed immediately";
+    EXPECT_EQ(counted(Counter::ConnectionsRefusedUnfinished), 3U);
+    EXPECT_EQ(counted(Counter::ConnectionsAccepted), most);
+    const std::string process = std::to_string(::getpid());
+    const std::string user = std::to_string(::getuid());
+    EXPECT_THAT(logged(),
+                ElementsAre("process " + process
+                            + " gets no more connections for now: 16384 of its own have ended and are not "
+                              "removed yet, and 16384 of user "
+                            + user + " in all"));
+
+    mayRun->signal();
+    EXPECT_TRUE(waitUntil([&] {
+        const SocketClient again(path);
+        return counted(Counter::ConnectionsAccepted) > most;
+    }));
+    stop();
+}
+
 // Also the starts of ten thousand sessions, which are answered when the sessions stop.
 TEST_F(ConnectionLimits, CallsThatStayUnansweredForHoursDoNotHoldUpTheOthers)
 {
@@ -405,7 +443,28 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
     again.write(callNumber(1));
     EXPECT_TRUE(waitForHistory(connected(), {"call 1"}));
     EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt);
-    EXPECT_EQ(logged().size(), 2U) << "it is logged again";
+    EXPECT_EQ(logged().size(), 1U) << "a user that stays at the limit writes no line at each refusal";
+}
+
+TEST_F(Descriptors, ARefusalIsLoggedAgainOnceHalfOfTheUsersConnectionsEnded)
+{
+    descriptors = 16;
+    listen();
+    std::vector<std::unique_ptr<SocketClient>> clients;
+    const auto connectUpToSix = [&] {
+        while (clients.size() < 6) {
+            clients.push_back(std::make_unique<SocketClient>(path));
+            connected();
+        }
+        EXPECT_EQ(SocketClient(path).readNumber(), std::nullopt);
+    };
+    connectUpToSix();
+    const auto ended = progress.look([&] { return std::vector(records.end() - 3, records.end()); });
+    clients.resize(3);
+    for (const auto& record : ended)
+        ASSERT_TRUE(waitForEnd(*record));
+    connectUpToSix();
+    EXPECT_EQ(logged().size(), 2U);
 }
 
 TEST_F(Descriptors, SomeAreKeptFromClients)
