@@ -20,7 +20,10 @@
 namespace platform {
 namespace {
 
-constexpr int mostAcceptedAtOnce = 4; // so that connected clients get their turn
+// Newcomers that are accepted at once, and while connected clients wait to be read: then clients that come and go
+// without a pause leave no more connections open than are read to their end, and the others get their turn.
+constexpr int mostAcceptedAtOnce = 4;
+constexpr int mostAcceptedBesideReaders = 1;
 constexpr std::size_t mostEventsAtOnce = 64;
 
 // While several clients have something to read, the thread reads for so long before it helps and looks who else has
@@ -200,7 +203,8 @@ bool LinuxConnectionListener::serve(Reader& reader, std::size_t mostBytes)
 
 void LinuxConnectionListener::acceptWaiting()
 {
-    for (int accepted = 0; accepted < mostAcceptedAtOnce; ++accepted) {
+    const int most = ready_.isEmpty() ? mostAcceptedAtOnce : mostAcceptedBesideReaders;
+    for (int accepted = 0; accepted < most; ++accepted) {
         if (connections_.size() >= mostConnections_)
             return pauseAccepting(std::nullopt, EMFILE);
         FileDescriptor socket(::accept4(socket_.descriptor(), nullptr, nullptr, SOCK_NONBLOCK | SOCK_CLOEXEC));

@@ -446,6 +446,20 @@ TEST_F(Descriptors, SomeConnectionsAreKeptFromEachUser)
     EXPECT_EQ(logged().size(), 1U) << "a user that stays at the limit writes no line at each refusal";
 }
 
+TEST_F(Descriptors, ClientsThatComeAndGoWithoutAPauseLeaveRoomForOthersOfTheirUser)
+{
+    constexpr std::uint64_t connections = 2000;
+    descriptors = 64; // of which 32 are for clients, and 24 for those of one user
+    beforeResuming = [](Connection& connection) { // an end takes longer than an acceptance
+        connection.setInvalidationHandler([] { std::this_thread::sleep_for(std::chrono::microseconds(50)); });
+    };
+    listen();
+    for (std::uint64_t number = 0; number < connections; ++number)
+        SocketClient(path).close();
+    EXPECT_TRUE(waitForCount(Counter::ConnectionsEnded, connections));
+    EXPECT_EQ(counted(Counter::ConnectionsRefused), 0U);
+}
+
 TEST_F(Descriptors, ARefusalIsLoggedAgainOnceHalfOfTheUsersConnectionsEnded)
 {
     descriptors = 16;
